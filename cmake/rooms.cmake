@@ -1,0 +1,35 @@
+# Warnings, sanitizers, and veltra_room(): one library for each folder of src/.
+#
+# A room's headers are visible only to the rooms that link it: its include directory is build/rooms/ROOM, which
+# holds nothing but a link to src/ROOM. An include that points up the ladder therefore does not build.
+
+add_library(veltra_options INTERFACE)
+target_compile_options(veltra_options INTERFACE -Wall -Wextra -Wconversion -Werror -fno-omit-frame-pointer)
+target_compile_options(veltra_options INTERFACE
+  $<$<COMPILE_LANG_AND_ID:CXX,Clang>:-Wthread-safety -Wthread-safety-beta>)
+if(VELTRA_SANITIZE)
+  target_compile_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE} -fno-sanitize-recover=all -O1 -g1)
+  target_link_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE})
+endif()
+target_link_libraries(veltra_options INTERFACE Threads::Threads)
+
+# veltra_room(NAME [PUBLIC libs…] [PRIVATE libs…] [EXCLUDE regex]): the sources are every .cpp under the folder.
+function(veltra_room name)
+  cmake_parse_arguments(ROOM "" "EXCLUDE" "PUBLIC;PRIVATE" ${ARGN})
+  file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*.cpp)
+  if(ROOM_EXCLUDE)
+    list(FILTER sources EXCLUDE REGEX "${ROOM_EXCLUDE}")
+  endif()
+  file(MAKE_DIRECTORY ${CMAKE_BINARY_DIR}/rooms/${name})
+  file(CREATE_LINK ${CMAKE_CURRENT_SOURCE_DIR} ${CMAKE_BINARY_DIR}/rooms/${name}/${name} SYMBOLIC)
+  if(sources)
+    add_library(veltra_${name} STATIC ${sources})
+    target_include_directories(veltra_${name} PUBLIC ${CMAKE_BINARY_DIR}/rooms/${name})
+    target_link_libraries(veltra_${name} PUBLIC ${ROOM_PUBLIC} PRIVATE veltra_options ${ROOM_PRIVATE})
+    set_target_properties(veltra_${name} PROPERTIES CXX_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
+  else()
+    add_library(veltra_${name} INTERFACE)
+    target_include_directories(veltra_${name} INTERFACE ${CMAKE_BINARY_DIR}/rooms/${name})
+    target_link_libraries(veltra_${name} INTERFACE ${ROOM_PUBLIC} ${ROOM_PRIVATE})
+  endif()
+endfunction()

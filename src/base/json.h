@@ -1,0 +1,26 @@
+// JSON by RFC 8259 to and from Value. Any thread. Exceptions: none.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+#include "base/result.h"
+#include "base/value.h"
+
+namespace veltrad {
+
+struct JSONError {
+  std::size_t offset;  // in bytes from the start of the text
+  std::string detail;  // one line
+};
+
+// Numbers without a fraction or exponent become integers (beyond 64 bits: reals); {"$date": seconds since 1970}
+// becomes a date, {"$data": "base64"} data; null entries of a dictionary are left out, elsewhere null is an error.
+// Depth at most 64; duplicate keys: the last one counts.
+Result<Value, JSONError> parseJSON(std::string_view text);
+
+enum class JSONStyle { compact, pretty };
+// The reverse of parseJSON. A real that is not finite is written as null; a text that is no UTF-8 is mended.
+std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact);
+
+}  // namespace veltrad

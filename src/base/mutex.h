@@ -1,0 +1,134 @@
+// Mutexes that the compiler checks: annotated for Clang's thread safety analysis, ranked at run time in debug
+// builds. Any thread.
+#pragma once
+
+#include <condition_variable>
+#include <mutex>
+
+#if defined(__clang__)
+#define VELTRA_ANNOTATE(x) __attribute__((x))
+#else
+#define VELTRA_ANNOTATE(x)
+#endif
+
+#define CAPABILITY(name) VELTRA_ANNOTATE(capability(name))
+#define SCOPED_CAPABILITY VELTRA_ANNOTATE(scoped_lockable)
+#define GUARDED_BY(m) VELTRA_ANNOTATE(guarded_by(m))
+#define PT_GUARDED_BY(m) VELTRA_ANNOTATE(pt_guarded_by(m))
+#define ACQUIRED_BEFORE(...) VELTRA_ANNOTATE(acquired_before(__VA_ARGS__))
+#define ACQUIRED_AFTER(...) VELTRA_ANNOTATE(acquired_after(__VA_ARGS__))
+#define REQUIRES(...) VELTRA_ANNOTATE(requires_capability(__VA_ARGS__))
+#define EXCLUDES(...) VELTRA_ANNOTATE(locks_excluded(__VA_ARGS__))
+#define ACQUIRE(...) VELTRA_ANNOTATE(acquire_capability(__VA_ARGS__))
+#define RELEASE(...) VELTRA_ANNOTATE(release_capability(__VA_ARGS__))
+#define RETURN_CAPABILITY(m) VELTRA_ANNOTATE(lock_returned(m))
+#define NO_THREAD_SAFETY_ANALYSIS VELTRA_ANNOTATE(no_thread_safety_analysis)
+
+namespace veltrad {
+
+// The place of a lock in the order: a thread takes only locks of a higher rank than the highest it holds. Leaves
+// have the highest rank and take nothing further.
+enum class LockRank : int {
+  sessionList = 10,
+  agent = 20,
+  flushCounters = 30,
+  session = 40,
+  backend = 50,
+  leaf = 100,
+};
+
+namespace lock_order {
+// Debug builds: aborts with both ranks when `rank` may not be taken now. Release builds: nothing.
+void taking(LockRank rank, bool recursive);
+void released(LockRank rank);
+}  // namespace lock_order
+
+class CAPABILITY("mutex") Mutex {
+ public:
+  explicit Mutex(LockRank rank) : _rank(rank) {}
+  Mutex(const Mutex&) = delete;
+  Mutex& operator=(const Mutex&) = delete;
+
+  void lock() ACQUIRE() {
+#ifndef NDEBUG
+    lock_order::taking(_rank, false);
+#endif
+    _mutex.lock();
+  }
+  void unlock() RELEASE() {
+    _mutex.unlock();
+#ifndef NDEBUG
+    lock_order::released(_rank);
+#endif
+  }
+
+ private:
+  friend class Condition;
+  std::mutex _mutex;
+  const LockRank _rank;
+};
+
+// The same thread may take it again. Analysed like a Mutex: a function that may hold it already says so with
+// REQUIRES and does not take it.
+class CAPABILITY("mutex") RecursiveMutex {
+ public:
+  explicit RecursiveMutex(LockRank rank) : _rank(rank) {}
+  RecursiveMutex(const RecursiveMutex&) = delete;
+  RecursiveMutex& operator=(const RecursiveMutex&) = delete;
+
+  void lock() ACQUIRE() {
+#ifndef NDEBUG
+    lock_order::taking(_rank, true);
+#endif
+    _mutex.lock();
+  }
+  void unlock() RELEASE() {
+    _mutex.unlock();
+#ifndef NDEBUG
+    lock_order::released(_rank);
+#endif
+  }
+
+ private:
+  std::recursive_mutex _mutex;
+  const LockRank _rank;
+};
+
+template <typename M>
+class SCOPED_CAPABILITY Lock {
+ public:
+  explicit Lock(M& mutex) ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
+  ~Lock() RELEASE() { _mutex.unlock(); }
+  Lock(const Lock&) = delete;
+  Lock& operator=(const Lock&) = delete;
+
+ private:
+  M& _mutex;
+};
+template <typename M>
+Lock(M&) -> Lock<M>;
+
+// Waits for a condition under a Mutex; always in a loop around the condition, or with wait_until's predicate.
+class Condition {
+ public:
+  void wait(Mutex& mutex) REQUIRES(mutex) {
+    std::unique_lock<std::mutex> held(mutex._mutex, std::adopt_lock);
+    _condition.wait(held);
+    held.release();
+  }
+  // False when `deadline` passed first.
+  template <typename TimePoint>
+  bool waitUntil(Mutex& mutex, TimePoint deadline) REQUIRES(mutex) {
+    std::unique_lock<std::mutex> held(mutex._mutex, std::adopt_lock);
+    const bool notified = _condition.wait_until(held, deadline) == std::cv_status::no_timeout;
+    held.release();
+    return notified;
+  }
+  void notifyOne() { _condition.notify_one(); }
+  void notifyAll() { _condition.notify_all(); }
+
+ private:
+  std::condition_variable _condition;
+};
+
+}  // namespace veltrad

@@ -1,0 +1,50 @@
+// Result<T, E>: a value, or the reason why there is none. No thread rule: a plain value.
+#pragma once
+
+#include <cstdlib>
+#include <utility>
+#include <variant>
+
+namespace veltrad {
+
+// Marks the error side when a Result is made: `return Failure{Error::tooDeep};`
+template <typename E>
+struct Failure {
+  E error;
+};
+template <typename E>
+Failure(E) -> Failure<E>;
+
+// Asking for the side that is not there is a broken invariant and aborts. A refusal is handled by its direct
+// caller; it is not passed on unread.
+template <typename T, typename E>
+class [[nodiscard]] Result {
+ public:
+  Result(T value) : _side(std::in_place_index<0>, std::move(value)) {}
+  Result(Failure<E> failure) : _side(std::in_place_index<1>, std::move(failure.error)) {}
+
+  bool ok() const { return _side.index() == 0; }
+  explicit operator bool() const { return ok(); }
+
+  T& value() & {
+    if (!ok()) std::abort();
+    return *std::get_if<0>(&_side);
+  }
+  const T& value() const& {
+    if (!ok()) std::abort();
+    return *std::get_if<0>(&_side);
+  }
+  T&& value() && {
+    if (!ok()) std::abort();
+    return std::move(*std::get_if<0>(&_side));
+  }
+  const E& error() const {
+    if (ok()) std::abort();
+    return *std::get_if<1>(&_side);
+  }
+
+ private:
+  std::variant<T, E> _side;
+};
+
+}  // namespace veltrad

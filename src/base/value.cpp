@@ -1,0 +1,233 @@
+// The value type's conversions and the dictionary's order. Any thread.
+#include "base/value.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <cmath>
+
+namespace veltrad {
+
+Value::Value(Data data) : _held(std::make_shared<const Data>(std::move(data))) {}
+Value::Value(Array array) : _held(std::make_shared<const Array>(std::move(array))) {}
+Value::Value(Dictionary dictionary) : _held(std::make_shared<const Dictionary>(std::move(dictionary))) {}
+
+const Data* Value::asData() const {
+  const auto* held = std::get_if<std::shared_ptr<const Data>>(&_held);
+  return held ? held->get() : nullptr;
+}
+
+const Array* Value::asArray() const {
+  const auto* held = std::get_if<std::shared_ptr<const Array>>(&_held);
+  return held ? held->get() : nullptr;
+}
+
+const Dictionary* Value::asDictionary() const {
+  const auto* held = std::get_if<std::shared_ptr<const Dictionary>>(&_held);
+  return held ? held->get() : nullptr;
+}
+
+bool Value::isNumber() const {
+  return type() == Type::signedInteger || type() == Type::unsignedInteger || type() == Type::real;
+}
+
+std::optional<bool> Value::toBoolean() const {
+  switch (type()) {
+    case Type::boolean: return std::get<bool>(_held);
+    case Type::signedInteger: return std::get<std::int64_t>(_held) != 0;
+    case Type::unsignedInteger: return std::get<std::uint64_t>(_held) != 0;
+    case Type::real: {
+      const double number = std::get<double>(_held);
+      if (!std::isfinite(number)) return std::nullopt;
+      return number != 0;
+    }
+    default: return std::nullopt;
+  }
+}
+
+std::optional<std::int64_t> Value::toInt64() const {
+  switch (type()) {
+    case Type::boolean: return std::get<bool>(_held) ? 1 : 0;
+    case Type::signedInteger: return std::get<std::int64_t>(_held);
+    case Type::unsignedInteger: return static_cast<std::int64_t>(std::get<std::uint64_t>(_held));
+    case Type::real: {
+      const double number = std::get<double>(_held);
+      // 64 bits of either sign: [-2^63, 2^64).
+      if (!(number >= -0x1p63 && number < 0x1p64)) return std::nullopt;
+      if (number < 0x1p63) return static_cast<std::int64_t>(number);
+      return static_cast<std::int64_t>(static_cast<std::uint64_t>(number));
+    }
+    default: return std::nullopt;
+  }
+}
+
+std::optional<std::int32_t> Value::toInt32() const {
+  const auto wide = toInt64();
+  if (!wide) return std::nullopt;
+  return static_cast<std::int32_t>(static_cast<std::uint32_t>(static_cast<std::uint64_t>(*wide)));
+}
+
+std::optional<std::uint32_t> Value::toUInt32() const {
+  const auto wide = toInt64();
+  if (!wide) return std::nullopt;
+  return static_cast<std::uint32_t>(static_cast<std::uint64_t>(*wide));
+}
+
+std::optional<std::uint16_t> Value::toUInt16() const {
+  const auto wide = toInt64();
+  if (!wide) return std::nullopt;
+  return static_cast<std::uint16_t>(static_cast<std::uint64_t>(*wide));
+}
+
+std::optional<double> Value::toDouble() const {
+  switch (type()) {
+    case Type::boolean: return std::get<bool>(_held) ? 1.0 : 0.0;
+    case Type::signedInteger: return static_cast<double>(std::get<std::int64_t>(_held));
+    case Type::unsignedInteger: return static_cast<double>(std::get<std::uint64_t>(_held));
+    case Type::real: {
+      const double number = std::get<double>(_held);
+      if (!std::isfinite(number)) return std::nullopt;
+      return number;
+    }
+    default: return std::nullopt;
+  }
+}
+
+std::optional<std::string> Value::toText() const {
+  switch (type()) {
+    case Type::boolean: return std::get<bool>(_held) ? "1" : "0";
+    case Type::signedInteger: return fmt::format("{}", std::get<std::int64_t>(_held));
+    case Type::unsignedInteger: return fmt::format("{}", std::get<std::uint64_t>(_held));
+    case Type::real: {
+      // fmt marks a whole real with ".0"; a decimal text has no need of it.
+      std::string text = fmt::format("{}", std::get<double>(_held));
+      if (text.ends_with(".0")) text.resize(text.size() - 2);
+      return text;
+    }
+    case Type::string: return std::get<std::string>(_held);
+    default: return std::nullopt;
+  }
+}
+
+bool Value::operator==(const Value& other) const {
+  if (type() == other.type()) {
+    switch (type()) {
+      case Type::data: return *asData() == *other.asData();
+      case Type::array: return asArray() == other.asArray() || *asArray() == *other.asArray();
+      case Type::dictionary:
+        return asDictionary() == other.asDictionary() || *asDictionary() == *other.asDictionary();
+      default: return _held == other._held;
+    }
+  }
+  if (type() == Type::signedInteger && other.type() == Type::unsignedInteger) {
+    const auto mine = std::get<std::int64_t>(_held);
+    return mine >= 0 && static_cast<std::uint64_t>(mine) == std::get<std::uint64_t>(other._held);
+  }
+  if (type() == Type::unsignedInteger && other.type() == Type::signedInteger) return other == *this;
+  return false;
+}
+
+Dictionary::Dictionary(std::initializer_list<Entry> entries) { *this = fromEntries(std::vector<Entry>(entries)); }
+
+Dictionary Dictionary::fromEntries(std::vector<Entry> entries) {
+  const auto before = [](const Entry& a, const Entry& b) { return a.first < b.first; };
+  if (!std::is_sorted(entries.begin(), entries.end(), before)) {
+    std::stable_sort(entries.begin(), entries.end(), before);
+  }
+  Dictionary made;
+  made._entries = std::move(entries);
+  auto& kept = made._entries;
+  std::size_t end = 0;
+  for (std::size_t i = 0; i < kept.size(); ++i) {
+    if (end > 0 && kept[end - 1].first == kept[i].first) {
+      kept[end - 1].second = std::move(kept[i].second);
+    } else {
+      if (end != i) kept[end] = std::move(kept[i]);
+      ++end;
+    }
+  }
+  kept.erase(kept.begin() + static_cast<std::ptrdiff_t>(end), kept.end());
+  return made;
+}
+
+std::vector<Dictionary::Entry>::iterator Dictionary::place(std::string_view key) {
+  return std::lower_bound(_entries.begin(), _entries.end(), key,
+                          [](const Entry& entry, std::string_view k) { return entry.first < k; });
+}
+
+const Value* Dictionary::find(std::string_view key) const {
+  const auto at = std::lower_bound(_entries.begin(), _entries.end(), key,
+                                   [](const Entry& entry, std::string_view k) { return entry.first < k; });
+  return at != _entries.end() && at->first == key ? &at->second : nullptr;
+}
+
+void Dictionary::set(std::string key, Value value) {
+  const auto at = place(key);
+  if (at != _entries.end() && at->first == key) {
+    at->second = std::move(value);
+  } else {
+    _entries.emplace(at, std::move(key), std::move(value));
+  }
+}
+
+bool Dictionary::erase(std::string_view key) {
+  const auto at = place(key);
+  if (at == _entries.end() || at->first != key) return false;
+  _entries.erase(at);
+  return true;
+}
+
+void Dictionary::merge(const Dictionary& other) {
+  std::vector<Entry> both;
+  both.reserve(_entries.size() + other._entries.size());
+  auto mine = _entries.begin();
+  for (const Entry& theirs : other._entries) {
+    while (mine != _entries.end() && mine->first < theirs.first) both.push_back(std::move(*mine++));
+    if (mine != _entries.end() && mine->first == theirs.first) ++mine;
+    both.push_back(theirs);
+  }
+  std::move(mine, _entries.end(), std::back_inserter(both));
+  _entries = std::move(both);
+}
+
+const std::string* Dictionary::string(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->asString() : nullptr;
+}
+
+const Dictionary* Dictionary::dictionary(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->asDictionary() : nullptr;
+}
+
+const Array* Dictionary::array(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->asArray() : nullptr;
+}
+
+std::optional<bool> Dictionary::boolean(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->toBoolean() : std::nullopt;
+}
+
+std::optional<std::int32_t> Dictionary::int32(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->toInt32() : std::nullopt;
+}
+
+std::optional<std::uint32_t> Dictionary::uint32(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->toUInt32() : std::nullopt;
+}
+
+std::optional<std::uint16_t> Dictionary::uint16(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->toUInt16() : std::nullopt;
+}
+
+std::optional<double> Dictionary::real(std::string_view key) const {
+  const Value* value = find(key);
+  return value ? value->toDouble() : std::nullopt;
+}
+
+}  // namespace veltrad

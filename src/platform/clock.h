@@ -1,0 +1,29 @@
+// The time of day. Any thread.
+#pragma once
+
+#include <cstdint>
+
+namespace veltrad::platform {
+
+// Since 1970-01-01 00:00:00 UTC.
+struct TimeValue {
+  std::int64_t seconds = 0;
+  std::int32_t microseconds = 0;  // 0 to 999,999
+  bool operator==(const TimeValue&) const = default;
+};
+
+// seconds + microseconds / 1,000,000
+double timevalToSeconds(TimeValue time);
+
+class Clock {
+ public:
+  virtual ~Clock() = default;
+  virtual TimeValue now() const = 0;
+};
+
+class SystemClock final : public Clock {
+ public:
+  TimeValue now() const override;
+};
+
+}  // namespace veltrad::platform

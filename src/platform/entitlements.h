@@ -1,0 +1,38 @@
+// Who may do what: etc/veltrad/entitlements.plist, reread when it changed. Any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "base/mutex.h"
+#include "base/value.h"
+#include "platform/peer.h"
+
+namespace veltrad::platform {
+
+class FileStore;
+
+// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a rule with
+// more than one of the three matches when all of them match, one with none never. A missing or unreadable file grants
+// nothing; an unreadable or malformed one is one error line a change.
+class Entitlements {
+ public:
+  Entitlements(FileStore& files, std::string path);
+  // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
+  std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
+
+ private:
+  FileStore& _files;
+  const std::string _path;
+  Mutex _mutex{LockRank::leaf};
+  std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
+  bool _read GUARDED_BY(_mutex) = false;
+  Array _rules GUARDED_BY(_mutex);
+};
+
+// The decision alone; exposed for its table of tests.
+std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
+
+}  // namespace veltrad::platform

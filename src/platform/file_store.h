@@ -1,0 +1,45 @@
+// Files as the daemon reads and replaces them. Any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "base/result.h"
+
+namespace veltrad::platform {
+
+struct FileFailure {
+  enum class Kind { notFound, noAccess, tooLarge, noSpace, other };
+  Kind kind;
+  std::string description;  // names the path: "/etc/veltrad/x.plist: Permission denied"
+};
+
+class FileStore {
+ public:
+  virtual ~FileStore() = default;
+  // A regular file of at most `most` bytes, whole.
+  virtual Result<std::string, FileFailure> read(const std::string& path, std::size_t most = 16u << 20) = 0;
+  // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW, mode 0600 unless `mode` says else), syncs, renames,
+  // syncs the directory. On failure the old file is untouched and the new one gone. Nothing: done.
+  virtual std::optional<FileFailure> replace(const std::string& path, std::string_view bytes,
+                                             unsigned mode = 0600) = 0;
+  // Renames within one directory.
+  virtual std::optional<FileFailure> rename(const std::string& from, const std::string& to) = 0;
+  // Changes when the file is written or replaced; absent while there is no such file.
+  virtual std::optional<std::uint64_t> stamp(const std::string& path) = 0;
+};
+
+class DiskFileStore final : public FileStore {
+ public:
+  Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
+  std::optional<FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
+  std::optional<FileFailure> rename(const std::string& from, const std::string& to) override;
+  std::optional<std::uint64_t> stamp(const std::string& path) override;
+};
+
+// Makes the directory and its parents (mode 0755) where they are missing.
+std::optional<FileFailure> makeDirectories(const std::string& path);
+
+}  // namespace veltrad::platform

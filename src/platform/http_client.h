@@ -1,0 +1,94 @@
+// HTTPS requests. Any thread may start one; completions run on the client's own thread and must not block.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "base/result.h"
+
+namespace veltrad::platform {
+
+using HTTPHeaders = std::vector<std::pair<std::string, std::string>>;
+
+struct HTTPRequest {
+  enum class Method { get, post };
+  // What bounds apply. Storebag requests are always admitted; event posts share 1,024 requests and 64 MiB; uploads
+  // run two at a time, others wait.
+  enum class Lane { storebag, event, upload };
+
+  Method method = Method::get;
+  Lane lane = Lane::event;
+  std::string url;  // https only
+  HTTPHeaders headers;  // control characters are removed from values; "Content-Length" is always the body's own
+  std::string body;
+  std::chrono::milliseconds timeout{60'000};  // total; connecting alone at most 10 s
+  // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.
+  std::uint32_t leastBytesPerSecond = 0;
+  std::size_t mostResponseBytes = 16u << 20;  // beyond it the transfer ends with an error; counted as bytes come
+};
+
+struct HTTPResponse {
+  int status = 0;
+  HTTPHeaders headers;  // of the last answer, names as sent
+  std::string body;
+
+  // The first value under this name, letter case ignored.
+  std::optional<std::string_view> header(std::string_view name) const;
+};
+
+struct HTTPError {
+  enum class Kind {
+    transport,  // refused, unresolvable, not trusted, cut, timed out, too large; not https
+    tooMany,    // over the lane's bound; nothing was sent
+    stopping,   // the daemon is stopping
+  };
+  Kind kind = Kind::transport;
+  std::string description;  // one line, a system text: "Could not resolve host: x"
+};
+
+using HTTPResult = Result<HTTPResponse, HTTPError>;
+using HTTPCompletion = std::function<void(HTTPResult)>;
+
+class HTTPClient {
+ public:
+  virtual ~HTTPClient() = default;
+  // `completion` runs exactly once, never inside this call.
+  virtual void start(HTTPRequest request, HTTPCompletion completion) = 0;
+  // Waits for the answer on the caller's thread; fails at once with `stopping` after failBlockingWaits().
+  virtual HTTPResult perform(HTTPRequest request) = 0;
+};
+
+struct HTTPClientSettings {
+  std::string extraCertificatesPath;  // PEM, trusted beside the system's; no such file: none
+};
+
+// libcurl's multi interface on one thread, which starts with the first request. Never forks; SIGPIPE must be ignored.
+class CurlHTTPClient final : public HTTPClient {
+ public:
+  explicit CurlHTTPClient(HTTPClientSettings settings);
+  ~CurlHTTPClient() override;  // ends every transfer with `stopping`, then joins
+  void start(HTTPRequest request, HTTPCompletion completion) override;
+  HTTPResult perform(HTTPRequest request) override;
+
+  // From now on perform() fails at once, those that wait included.
+  void failBlockingWaits();
+  // Waits until no transfer is under way, at most until `deadline`; what is left then ends with `stopping`.
+  void drain(std::chrono::steady_clock::time_point deadline);
+  // True when an empty task passed the thread within `within`; true also when the thread was never started.
+  bool passesEmptyTask(std::chrono::milliseconds within);
+  // Event posts that have neither completed nor failed.
+  std::size_t underWay() const;
+
+ private:
+  struct Impl;
+  std::unique_ptr<Impl> _impl;
+};
+
+}  // namespace veltrad::platform

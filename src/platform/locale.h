@@ -1,0 +1,35 @@
+// The current locale's country and the local time zone's offset. Any thread.
+#pragma once
+
+#include <optional>
+#include <string>
+
+namespace veltrad::platform {
+
+class FileStore;
+
+class Locale {
+ public:
+  virtual ~Locale() = default;
+  // "DE" for "de_DE.UTF-8"; nothing for "C", "POSIX" and names without a country.
+  virtual std::optional<std::string> countryCode() = 0;
+  // Seconds east of GMT, now, daylight saving included.
+  virtual int timeZoneOffset() = 0;
+};
+
+// The first that is set and not empty of LC_ALL, LC_MESSAGES, LANG, then "LANG" in the locale.conf given.
+class EnvironmentLocale final : public Locale {
+ public:
+  EnvironmentLocale(FileStore& files, std::string localeConfigurationPath);
+  std::optional<std::string> countryCode() override;
+  int timeZoneOffset() override;
+
+ private:
+  FileStore& _files;
+  const std::string _path;
+};
+
+// The country part of a locale name; exposed for its table of tests.
+std::optional<std::string> countryOfLocaleName(const std::string& name);
+
+}  // namespace veltrad::platform

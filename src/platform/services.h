@@ -1,0 +1,43 @@
+// The real services, built once by a program's main and handed on by reference, a few to each room.
+#pragma once
+
+#include "platform/clock.h"
+#include "platform/counters.h"
+#include "platform/device_properties.h"
+#include "platform/entitlements.h"
+#include "platform/file_store.h"
+#include "platform/http_client.h"
+#include "platform/locale.h"
+#include "platform/preferences.h"
+#include "platform/random.h"
+#include "platform/root.h"
+#include "platform/service_manager.h"
+#include "platform/transaction.h"
+
+namespace veltrad::platform {
+
+struct Services {
+  explicit Services(Root where)
+      : root(std::move(where)),
+        preferences(files, root.preferencesDirectory()),
+        device(files, root.devicePath()),
+        locale(files, root.localeConfigurationPath()),
+        entitlements(files, root.entitlementsPath()),
+        transaction(serviceManager),
+        http({root.extraCertificatesPath()}) {}
+
+  const Root root;
+  SystemClock clock;
+  UnseededSequence random;
+  DiskFileStore files;
+  FilePreferences preferences;
+  MachineProperties device;
+  EnvironmentLocale locale;
+  Entitlements entitlements;
+  ServiceManager serviceManager;
+  ServiceTransaction transaction;
+  Counters counters;
+  CurlHTTPClient http;
+};
+
+}  // namespace veltrad::platform
