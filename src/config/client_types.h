@@ -1,0 +1,22 @@
+// The fixed tables of client types and environments. Pure functions; any thread.
+#pragma once
+
+#include <cstdint>
+
+namespace veltrad {
+
+// Client types (also called component types) are 0 to kVeltraClientTypeCount - 1.
+inline constexpr std::int32_t kVeltraClientTypeCount = 18;
+
+// The last path component of the storebag's URL, and the key of the storebag cache. Null for the client types
+// that have no storebag, and for every value outside the range.
+const char* storebagNameForClientType(std::int32_t clientType);
+
+// The code that marks the reports of sessions of this type. Null outside the range.
+const char* senderCodeForComponentType(std::int32_t componentType);
+
+// The name of a storebag's section: 1 "development", 2 "florn_internal", 3 "seed", 4 "release"; null for any
+// other.
+const char* sectionNameForEnvironment(std::uint32_t environment);
+
+}  // namespace veltrad

@@ -1,0 +1,27 @@
+// Picks from a client type's storebag the section of the process's environment. The caller's thread.
+#pragma once
+
+#include "config/storebag_download.h"
+#include "config/storebag_source.h"
+
+namespace veltrad {
+
+// The real source: downloads the storebag at each call. Keeps no state; any number of threads at once. What
+// the constructor takes must outlive it.
+class StorebagSections final : public StorebagSource {
+ public:
+  // A cached copy stays fresh at most this long on the storebag's own word ("refresh_cycle").
+  static constexpr std::int32_t kMostRefreshCycleSeconds = 86'400;
+
+  StorebagSections(platform::HTTPClient& http, ProcessSettings& settings, const Veltra& veltra);
+
+  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
+      std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
+      std::optional<std::string>* lastModified) override;
+
+ private:
+  ProcessSettings& _settings;
+  StorebagDownload _download;
+};
+
+}  // namespace veltrad

@@ -1,0 +1,25 @@
+// Where the agent gets storebag sections from. The caller's thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+#include "base/value.h"
+
+namespace veltrad {
+
+class StorebagSource {
+ public:
+  virtual ~StorebagSource() = default;
+
+  // The section of the client type's storebag for the process's environment, or nothing. May block for an
+  // exchange with the server; takes no lock of its own. The slots belong to the caller: `maxAge` (seconds,
+  // out), `version` (out, written only with a section), `notModified` (out, set to true only), `lastModified`
+  // (in and out; may be null).
+  virtual std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
+      std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
+      std::optional<std::string>* lastModified) = 0;
+};
+
+}  // namespace veltrad
