@@ -1,4 +1,5 @@
-// Frames of the wire protocol (docs/wire-protocol.md): bytes in, frames out; no socket here. Any thread, one at a time.
+// Frames of the wire protocol (docs/wire-protocol.md): bytes in, frames out; no socket here. Any thread, one
+// at a time.
 #pragma once
 
 #include <cstdint>
@@ -23,7 +24,9 @@ struct FrameHeader {
   std::uint8_t descriptors = 0;
   std::uint32_t callID = 0;
 
-  std::size_t bodyLimit() const { return kind == FrameKind::largeCall ? kLargeFrameBodyLimit : kFrameBodyLimit; }
+  std::size_t bodyLimit() const {
+    return kind == FrameKind::largeCall ? kLargeFrameBodyLimit : kFrameBodyLimit;
+  }
   // Within its bound, and 0 or 1 descriptors; anything else ends the connection.
   bool possible() const { return bodyLength <= bodyLimit() && descriptors <= 1; }
 };
@@ -32,15 +35,16 @@ FrameHeader decodeFrameHeader(const char* bytes /* kFrameHeaderBytes */);
 void encodeFrameHeader(const FrameHeader& header, char* bytes /* kFrameHeaderBytes */);
 
 // The frame, header and body, ready for the socket.
-std::string makeFrame(FrameKind kind, std::uint32_t callID, const Dictionary& body, std::uint8_t descriptors = 0);
+std::string makeFrame(FrameKind kind, std::uint32_t callID, const Dictionary& body,
+                      std::uint8_t descriptors = 0);
 
 struct Frame {
   FrameHeader header;
   std::string_view body;  // valid until the reader is next changed
 };
 
-// Collects bytes and yields whole frames. Its buffer grows with the bytes that came, never by what a header declares,
-// and shrinks back to a small size once a large frame was taken.
+// Collects bytes and yields whole frames. Its buffer grows with the bytes that came, never by what a header
+// declares, and shrinks back to a small size once a large frame was taken.
 class FrameReader {
  public:
   enum class Next { frame, needMore, impossible };

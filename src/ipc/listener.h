@@ -1,0 +1,106 @@
+// The front door: accepts clients, gives each connection a thread of its own and reaps the threads that
+// ended.
+#pragma once
+
+#include <chrono>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "base/mutex.h"
+#include "ipc/descriptor.h"
+#include "ipc/service_socket.h"
+#include "ipc/thread.h"
+#include "platform/counters.h"
+#include "platform/entitlements.h"
+#include "protocol/connection.h"
+
+namespace veltrad {
+
+namespace ipc {
+
+class SocketConnection;
+
+struct ListenerOptions {
+  ServiceSocket socket;
+  platform::Entitlements& entitlements;
+  platform::Counters& counters;
+  std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
+  std::size_t mostConnections = 4096;
+  std::size_t mostConnectionsOfOneUser = 1024;
+};
+
+}  // namespace ipc
+
+// Job: every client that connects gets a Connection, on which the delegate decides on that connection's own
+// thread; a refused one gets a refusal frame that says why. The delegate, the entitlements and the counters
+// outlive it. resume() and invalidate() belong to the thread that made it, which is never a connection's own.
+class Listener {
+ public:
+  Listener(ipc::ListenerOptions options, ListenerDelegate& delegate);
+  // Invalidates first if nobody did, and waits for every thread without a bound.
+  ~Listener();
+  Listener(const Listener&) = delete;
+  Listener& operator=(const Listener&) = delete;
+
+  // Starts the accepting thread, once. False when no thread could be had; the reason is logged.
+  bool resume();
+
+  // Stops: closes the listening socket (and removes its file if this process made it), takes no more bytes
+  // from any client, runs the frames that had arrived whole, invalidates every connection and joins all
+  // threads. Waits until `deadline` at most: then calls that wait for their turn are given up, and the answer
+  // is the number of connections whose call is still running; their threads are joined by the destructor.
+  // Twice does nothing new.
+  std::size_t invalidate(std::chrono::steady_clock::time_point deadline);
+
+ private:
+  struct Client {
+    std::shared_ptr<ipc::SocketConnection> connection;
+    ipc::Thread thread;
+    unsigned uid = 0;
+  };
+
+  void acceptLoop();
+  void acceptOne();
+  void acceptWithSpare();
+  void serve(ipc::Descriptor socket);
+  std::optional<std::string> boundReached(unsigned uid);
+  void admit(ipc::Descriptor socket, platform::Peer peer);
+  void runConnection(std::uint64_t number, std::shared_ptr<ipc::SocketConnection> connection);
+  void ended(std::uint64_t number);
+  void reap();
+  void wake();
+  void warnOfAccept(int error);
+
+  // Constant after construction.
+  ListenerDelegate& _delegate;
+  platform::Entitlements& _entitlements;
+  platform::Counters& _counters;
+  const std::string _entitlementsPath;
+  const std::size_t _mostConnections;
+  const std::size_t _mostConnectionsOfOneUser;
+  const ipc::Descriptor _wakeUp;
+
+  // The accepting thread's while it runs, else the owner's.
+  ipc::ServiceSocket _socket;
+  ipc::Descriptor _spare;
+  std::chrono::steady_clock::time_point _lastWarning{};
+  std::uint64_t _nextNumber = 1;
+
+  // The owner's.
+  ipc::Thread _acceptThread;
+
+  Mutex _mutex{LockRank::leaf};
+  Condition _changed;
+  bool _stopping GUARDED_BY(_mutex) = false;
+  std::map<std::uint64_t, Client> _clients GUARDED_BY(_mutex);
+  std::map<unsigned, std::size_t> _clientsOfUser GUARDED_BY(_mutex);
+  std::vector<ipc::Thread> _finished GUARDED_BY(_mutex);
+};
+
+namespace ipc {
+using veltrad::Listener;
+}
+
+}  // namespace veltrad

@@ -1,0 +1,42 @@
+// The socket on which clients reach the daemon, and the lock that says which process is the daemon. Made and
+// used by one thread at a time.
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "base/result.h"
+#include "ipc/descriptor.h"
+#include "platform/root.h"
+
+namespace veltrad::ipc {
+
+// A listening Unix stream socket. The lock on run/veltrad/lock is held as long as the object lives.
+class ServiceSocket {
+ public:
+  // `madePath`: the socket's file, where this process made it; empty for a socket that was handed over.
+  ServiceSocket(Descriptor listening, Descriptor lock, std::string madePath)
+      : _listening(std::move(listening)), _lock(std::move(lock)), _madePath(std::move(madePath)) {}
+  ServiceSocket(ServiceSocket&&) = default;
+  ServiceSocket& operator=(ServiceSocket&&) = delete;
+  ~ServiceSocket() { close(); }
+
+  int listening() const { return _listening.get(); }
+  // Stops listening and removes the socket's file if this process made it; keeps the lock. Twice does
+  // nothing.
+  void close();
+
+ private:
+  Descriptor _listening;
+  Descriptor _lock;
+  std::string _madePath;
+};
+
+// Takes the lock, then uses `handedOver` (socket activation) as it is, or removes a stale socket file and
+// makes run/veltrad/com.florn.veltrad.sock: mode 0666, close-on-exec, non-blocking, 1,024 connections waiting
+// at most. The run directory must be there. The error is one line that names what is in the way and what to
+// do.
+Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
+                                                     std::optional<int> handedOver);
+
+}  // namespace veltrad::ipc
