@@ -1,0 +1,161 @@
+// UTF-8 by RFC 3629, simple lower case by utf8proc, log lines. Any thread.
+#include "base/text.h"
+
+#include <utf8proc.h>
+
+#include <algorithm>
+#include <cstdint>
+
+namespace veltrad {
+
+namespace {
+
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+
+std::uint8_t byteAt(std::string_view text, std::size_t i) {
+  return static_cast<std::uint8_t>(text[i]);
+}
+
+bool isContinuation(std::uint8_t byte) {
+  return (byte & 0xC0) == 0x80;
+}
+
+// Length of a sequence that begins with this byte; 0 when none does.
+std::size_t sequenceLength(std::uint8_t first) {
+  if (first < 0x80) return 1;
+  if (first >= 0xC2 && first <= 0xDF) return 2;
+  if ((first & 0xF0) == 0xE0) return 3;
+  if (first >= 0xF0 && first <= 0xF4) return 4;
+  return 0;
+}
+
+// The second byte of a sequence of three or four is what shuts out overlong forms, surrogates and values too
+// high.
+bool isSecond(std::uint8_t first, std::uint8_t second) {
+  switch (first) {
+    case 0xE0:
+      return second >= 0xA0 && second <= 0xBF;
+    case 0xED:
+      return second >= 0x80 && second <= 0x9F;
+    case 0xF0:
+      return second >= 0x90 && second <= 0xBF;
+    case 0xF4:
+      return second >= 0x80 && second <= 0x8F;
+    default:
+      return isContinuation(second);
+  }
+}
+
+void appendHex(std::string& out, std::string_view bytes) {
+  constexpr char kHex[] = "0123456789ABCDEF";
+  for (std::size_t i = 0; i < bytes.size(); ++i) {
+    out += "\\x";
+    out += kHex[byteAt(bytes, i) >> 4];
+    out += kHex[byteAt(bytes, i) & 0xF];
+  }
+}
+
+bool isControl(char32_t code) {
+  return code < 0x20 || (code >= 0x7F && code <= 0x9F) || code == 0x2028 || code == 0x2029;
+}
+
+}  // namespace
+
+UTF8Character characterAt(std::string_view text, std::size_t i) {
+  const std::uint8_t first = byteAt(text, i);
+  if (first < 0x80) return {1, first};
+  const std::size_t length = sequenceLength(first);
+  if (length == 0 || text.size() - i < length || !isSecond(first, byteAt(text, i + 1))) return {0, 0};
+  std::uint32_t code = first & (0xFFu >> (length + 1));
+  for (std::size_t k = 1; k < length; ++k) {
+    const std::uint8_t next = byteAt(text, i + k);
+    if (!isContinuation(next)) return {0, 0};
+    code = code << 6 | (next & 0x3Fu);
+  }
+  return {length, code};
+}
+
+void appendUTF8(std::string& text, char32_t code) {
+  utf8proc_uint8_t bytes[4];
+  const auto length = utf8proc_encode_char(static_cast<utf8proc_int32_t>(code), bytes);
+  text.append(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(length));
+}
+
+bool isUTF8(std::string_view bytes) {
+  if (isASCII(bytes)) return true;
+  for (std::size_t i = 0; i < bytes.size();) {
+    const std::size_t length = characterAt(bytes, i).length;
+    if (length == 0) return false;
+    i += length;
+  }
+  return true;
+}
+
+std::string toUTF8(std::string_view bytes) {
+  std::string out;
+  out.reserve(bytes.size());
+  for (std::size_t i = 0; i < bytes.size();) {
+    const std::size_t length = characterAt(bytes, i).length;
+    out += length == 0 ? kReplacement : bytes.substr(i, length);
+    i += length == 0 ? 1 : length;
+  }
+  return out;
+}
+
+std::string_view withoutIncompleteEnd(std::string_view text) {
+  const std::size_t farthest = std::min<std::size_t>(text.size(), 3);
+  for (std::size_t back = 1; back <= farthest; ++back) {
+    const std::size_t start = text.size() - back;
+    const std::uint8_t first = byteAt(text, start);
+    if (isContinuation(first)) continue;
+    const bool incomplete =
+        sequenceLength(first) > back && (back == 1 || isSecond(first, byteAt(text, start + 1)));
+    return incomplete ? text.substr(0, start) : text;
+  }
+  return text;
+}
+
+std::string lowerCase(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  for (std::size_t i = 0; i < text.size();) {
+    const UTF8Character character = characterAt(text, i);
+    if (character.length <= 1) {
+      const char c = text[i++];
+      out += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+      continue;
+    }
+    appendUTF8(out, static_cast<char32_t>(utf8proc_tolower(static_cast<utf8proc_int32_t>(character.code))));
+
+    i += character.length;
+  }
+  return out;
+}
+
+bool equalIgnoringCase(std::string_view a, std::string_view b) {
+  return a == b || lowerCase(a) == lowerCase(b);
+}
+
+bool containsIgnoringCase(std::string_view text, std::string_view part) {
+  return lowerCase(text).find(lowerCase(part)) != std::string::npos;
+}
+
+std::string escapedForLog(std::string_view text) {
+  std::string out;
+  out.reserve(text.size());
+  for (std::size_t i = 0; i < text.size();) {
+    const UTF8Character character = characterAt(text, i);
+    const std::size_t length = std::max<std::size_t>(character.length, 1);
+    const std::string_view bytes = text.substr(i, length);
+    if (character.length == 0 || isControl(character.code)) {
+      appendHex(out, bytes);
+    } else {
+      out += bytes;
+      if (character.code == '\\') out += '\\';
+    }
+    i += length;
+  }
+  return out;
+}
+
+}  // namespace veltrad
