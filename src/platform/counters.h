@@ -13,21 +13,24 @@ namespace veltrad::platform {
 
 class FileStore;
 
-// A reason is a short text that a person can read, "message dropped: the session has no backends": what happened,
-// then why. The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970, "counts": {reason: n}}.
+// A reason is a short text that a person can read, "message dropped: the session has no backends": what
+// happened, then why. The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970,
+// "counts": {reason: n}}.
 class Counters {
  public:
   void count(std::string_view reason, std::uint64_t times = 1);
   std::uint64_t value(std::string_view reason) const;
   Dictionary snapshot() const;
 
-  // Replaces the file when something changed since the last time. The owner calls it at most once a second.
+  // Replaces the file (mode 0644) when something changed since the last time; where that fails, it is tried
+  // again at the next call, with one error line for an episode. The owner calls it at most once a second.
   void writeIfChanged(FileStore& files, const std::string& path, double startedAt);
 
  private:
   mutable Mutex _mutex{LockRank::leaf};
   std::map<std::string, std::uint64_t, std::less<>> _counts GUARDED_BY(_mutex);
   bool _changed GUARDED_BY(_mutex) = true;
+  bool _failed GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace veltrad::platform

@@ -32,6 +32,12 @@ class Root {
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }
+  // Where the adaptor bundle is looked for.
+  std::string adaptorBundleDirectory() const {
+    return path(
+        "System/Library/PrivateFrameworks/PellmarchServices.framework/Frameworks/"
+        "PellmarchPerformance.framework");
+  }
   std::string publicKeyPath() const { return path("usr/share/veltra/publicKey.der"); }
   std::string packageManifestPath() const { return path("usr/share/veltra/package.plist"); }
 

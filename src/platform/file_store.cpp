@@ -1,0 +1,159 @@
+// Files on disk. Any thread; no state of its own.
+#include "platform/file_store.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <system_error>
+
+#include "platform/file_descriptor.h"
+#include "platform/uuid.h"
+
+namespace veltrad::platform {
+
+namespace {
+
+FileFailure failureOf(const std::string& path, int error) {
+  using Kind = FileFailure::Kind;
+  Kind kind = Kind::other;
+  if (error == ENOENT || error == ENOTDIR) kind = Kind::notFound;
+  if (error == EACCES || error == EPERM) kind = Kind::noAccess;
+  if (error == ENOSPC || error == EDQUOT) kind = Kind::noSpace;
+  if (error == EFBIG) kind = Kind::tooLarge;
+  return {kind, path + ": " + std::generic_category().message(error)};
+}
+
+FileFailure tooLarge(const std::string& path, std::size_t most) {
+  return {FileFailure::Kind::tooLarge, path + ": larger than " + std::to_string(most) + " bytes"};
+}
+
+std::string directoryOf(const std::string& path) {
+  const auto slash = path.rfind('/');
+  if (slash == std::string::npos) return ".";
+  return slash == 0 ? "/" : path.substr(0, slash);
+}
+
+// 0, or errno.
+int writeAll(int descriptor, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return errno;
+    bytes.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
+
+// A full disk or a quota may show at the sync or the close alone.
+int writeNewFile(const std::string& path, std::string_view bytes, unsigned mode) {
+  FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+  if (!file.isOpen()) return errno;
+  int error = writeAll(file.get(), bytes);
+  if (error == 0 && ::fchmod(file.get(), mode) != 0) error = errno;  // exactly `mode`, whatever the umask
+  if (error == 0 && ::fsync(file.get()) != 0) error = errno;
+  if (::close(file.release()) != 0 && error == 0) error = errno;
+  if (error != 0) ::unlink(path.c_str());
+  return error;
+}
+
+int syncDirectory(const std::string& path) {
+  const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!directory.isOpen()) return errno;
+  if (::fsync(directory.get()) == 0) return 0;
+  return errno == EINVAL ? 0 : errno;  // EINVAL: a file system that has nothing to sync here
+}
+
+std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
+  for (int i = 0; i < 8; ++i) {
+    hash = (hash ^ (number & 0xff)) * 0x100000001b3u;  // FNV-1a
+    number >>= 8;
+  }
+  return hash;
+}
+
+}  // namespace
+
+Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, std::size_t most) {
+  // O_NONBLOCK: a pipe under that name must not hold the caller.
+  const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  if (!file.isOpen()) return Failure{failureOf(path, errno)};
+  struct stat status {};
+  if (::fstat(file.get(), &status) != 0) return Failure{failureOf(path, errno)};
+  if (!S_ISREG(status.st_mode)) {
+    return Failure{FileFailure{FileFailure::Kind::other, path + ": not a regular file"}};
+  }
+  if (static_cast<std::uint64_t>(status.st_size) > most) return Failure{tooLarge(path, most)};
+
+  // The size is a hint alone: it is 0 under /proc, and a file may grow.
+  std::string bytes;
+  std::size_t length = 0;
+  std::size_t room = static_cast<std::size_t>(status.st_size) + 1;
+  while (true) {
+    bytes.resize(length + room);
+    const ssize_t got = ::read(file.get(), bytes.data() + length, room);
+    if (got < 0 && errno == EINTR) continue;
+    if (got < 0) return Failure{failureOf(path, errno)};
+    length += static_cast<std::size_t>(got);
+    if (length > most) return Failure{tooLarge(path, most)};
+    if (got == 0) break;
+    room = std::max<std::size_t>(bytes.size() - length, 4'096);
+  }
+  bytes.resize(length);
+  return bytes;
+}
+
+std::optional<FileFailure> DiskFileStore::replace(const std::string& path, std::string_view bytes,
+                                                  unsigned mode) {
+  const std::string fresh = path + "." + randomUUIDText().substr(0, 8) + ".new";
+  if (const int error = writeNewFile(fresh, bytes, mode)) return failureOf(path, error);
+  if (::rename(fresh.c_str(), path.c_str()) != 0) {
+    const int error = errno;
+    ::unlink(fresh.c_str());
+    return failureOf(path, error);
+  }
+  if (const int error = syncDirectory(directoryOf(path))) return failureOf(directoryOf(path), error);
+  return std::nullopt;
+}
+
+std::optional<FileFailure> DiskFileStore::rename(const std::string& from, const std::string& to) {
+  if (::rename(from.c_str(), to.c_str()) != 0) return failureOf(from, errno);
+  if (const int error = syncDirectory(directoryOf(to))) return failureOf(directoryOf(to), error);
+  return std::nullopt;
+}
+
+std::optional<std::uint64_t> DiskFileStore::stamp(const std::string& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0) return std::nullopt;
+  std::uint64_t hash = 0xcbf29ce484222325u;
+  for (const auto part :
+       {static_cast<std::uint64_t>(status.st_dev), static_cast<std::uint64_t>(status.st_ino),
+        static_cast<std::uint64_t>(status.st_size), static_cast<std::uint64_t>(status.st_mtim.tv_sec),
+        static_cast<std::uint64_t>(status.st_mtim.tv_nsec), static_cast<std::uint64_t>(status.st_ctim.tv_sec),
+        static_cast<std::uint64_t>(status.st_ctim.tv_nsec)}) {
+    hash = mixed(hash, part);
+  }
+  return hash;
+}
+
+std::optional<FileFailure> makeDirectories(const std::string& path) {
+  for (std::size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
+    const std::string part = path.substr(0, end);
+    if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) {
+      const int error = errno;
+      // A parent on a read-only or closed file system that is there already is none of our concern.
+      struct stat status {};
+      if (::stat(part.c_str(), &status) != 0) return failureOf(part, error);
+    }
+    if (end == std::string::npos) break;
+  }
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0) return failureOf(path, errno);
+  if (!S_ISDIR(status.st_mode)) return failureOf(path, ENOTDIR);
+  return std::nullopt;
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,227 @@
+// The one process-wide log: the journal, standard error or syslog. Any thread; a line is one system call.
+#include "platform/log.h"
+
+#include <sys/stat.h>
+#include <sys/uio.h>
+#include <syslog.h>
+#include <time.h>
+#include <unistd.h>
+
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <systemd/sd-journal.h>
+
+#include <cerrno>
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <memory>
+#include <optional>
+#include <utility>
+
+#include "base/mutex.h"
+#include "base/text.h"
+
+namespace veltrad::platform {
+
+namespace log {
+
+std::atomic<int> threshold{static_cast<int>(LogLevel::info)};
+
+namespace {
+
+constexpr int kUserFacility = LOG_USER;
+
+struct Target {
+  enum class Kind { standardError, terminal, journal, syslog };
+  Kind kind = Kind::standardError;
+  std::string program;  // openlog() keeps a pointer to it
+  int facility = kUserFacility;
+};
+
+// A line may be written under any other lock, the leaves included: this one is held for two copies and takes
+// nothing.
+struct State {
+  Mutex mutex{static_cast<LockRank>(static_cast<int>(LockRank::leaf) + 1)};
+  std::shared_ptr<const Target> target GUARDED_BY(mutex) = std::make_shared<const Target>();
+  std::shared_ptr<const Sink> sink GUARDED_BY(mutex);
+};
+
+State& state() {
+  static State* const only = new State;  // never freed: threads may write lines until the process is gone
+  return *only;
+}
+
+const char* nameOf(LogLevel level) {
+  switch (level) {
+    case LogLevel::error:
+      return "error";
+    case LogLevel::warning:
+      return "warning";
+    case LogLevel::info:
+      return "info";
+    case LogLevel::debug:
+      return "debug";
+  }
+  return "unknown";
+}
+
+std::string localTime() {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  tm parts{};
+  ::localtime_r(&now.tv_sec, &parts);
+  char text[32];
+  const std::size_t length = ::strftime(text, sizeof text, "%H:%M:%S", &parts);
+  std::snprintf(text + length, sizeof text - length, ".%03ld", now.tv_nsec / 1'000'000);
+  return text;
+}
+
+void writeToStandardError(const std::string& text) {
+  const char* next = text.data();
+  std::size_t left = text.size();
+  while (left > 0) {
+    const ssize_t written = ::write(STDERR_FILENO, next, left);
+    if (written < 0 && errno == EINTR) continue;
+    if (written <= 0) return;  // there is nobody left to tell
+    next += written;
+    left -= static_cast<std::size_t>(written);
+  }
+}
+
+void writeToJournal(const Target& target, LogLevel level, const std::string& line) {
+  const std::string fields[] = {"MESSAGE=" + line, "PRIORITY=" + std::to_string(static_cast<int>(level)),
+                                "SYSLOG_IDENTIFIER=" + target.program,
+                                "SYSLOG_FACILITY=" + std::to_string(target.facility >> 3)};
+  iovec vectors[std::size(fields)];
+  for (std::size_t i = 0; i < std::size(fields); ++i) {
+    vectors[i] = {const_cast<char*>(fields[i].data()), fields[i].size()};
+  }
+  ::sd_journal_sendv(vectors, static_cast<int>(std::size(vectors)));
+}
+
+void writeTo(const Target& target, LogLevel level, const std::string& line) {
+  switch (target.kind) {
+    case Target::Kind::standardError:
+      return writeToStandardError("<" + std::to_string(static_cast<int>(level)) + ">" + line + "\n");
+    case Target::Kind::terminal:
+      return writeToStandardError(localTime() + " " + nameOf(level) + ": " + line + "\n");
+    case Target::Kind::journal:
+      return writeToJournal(target, level, line);
+    case Target::Kind::syslog:
+      return ::syslog(target.facility | static_cast<int>(level), "%s", line.c_str());
+  }
+}
+
+std::string formatted(const char* format, va_list arguments) {
+  va_list again;
+  va_copy(again, arguments);
+  char buffer[1'024];
+  const int length = std::vsnprintf(buffer, sizeof buffer, format, arguments);
+  std::string text;
+  if (length > 0 && static_cast<std::size_t>(length) < sizeof buffer) {
+    text.assign(buffer, static_cast<std::size_t>(length));
+  } else if (length > 0) {
+    text.resize(static_cast<std::size_t>(length));
+    std::vsnprintf(text.data(), text.size() + 1, format, again);
+  }
+  va_end(again);
+  return text;
+}
+
+bool standardErrorIsTheJournal() {
+  const char* named =
+      std::getenv("JOURNAL_STREAM");  // "DEVICE:INODE" of the stream that the service manager made
+  struct stat status {};
+  if (!named || ::fstat(STDERR_FILENO, &status) != 0) return false;
+  return named == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
+}
+
+Target::Kind standardErrorKind() {
+  return ::isatty(STDERR_FILENO) == 1 ? Target::Kind::terminal : Target::Kind::standardError;
+}
+
+// Absent: no such choice.
+std::optional<Target::Kind> kindForChoice(std::string_view choice) {
+  if (choice == "auto") return standardErrorIsTheJournal() ? Target::Kind::journal : standardErrorKind();
+  if (choice == "stderr") return standardErrorKind();
+  if (choice != "syslog") return std::nullopt;
+  return ::access("/run/systemd/journal/socket", F_OK) == 0 ? Target::Kind::journal : Target::Kind::syslog;
+}
+
+std::optional<LogLevel> levelForName(std::string_view name) {
+  for (const LogLevel level : {LogLevel::error, LogLevel::warning, LogLevel::info, LogLevel::debug}) {
+    if (name == nameOf(level)) return level;
+  }
+  return std::nullopt;
+}
+
+std::string_view environment(const char* name, std::string_view fallback) {
+  const char* value = std::getenv(name);
+  return value && *value ? std::string_view(value) : fallback;
+}
+
+std::shared_ptr<const Target> exchangeTarget(std::shared_ptr<const Target> target) {
+  Lock lock(state().mutex);
+  return std::exchange(state().target, std::move(target));
+}
+
+}  // namespace
+
+void write(LogLevel level, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  std::string text = formatted(format, arguments);
+  va_end(arguments);
+  if (!text.empty() && text.back() == '\n') text.pop_back();
+  const std::string line = escapedForLog(text);
+
+  std::shared_ptr<const Target> target;
+  std::shared_ptr<const Sink> sink;
+  {
+    Lock lock(state().mutex);
+    target = state().target;
+    sink = state().sink;
+  }
+  if (sink) return (*sink)(level, line);
+  writeTo(*target, level, line);
+}
+
+void setSink(Sink sink) {
+  auto next = sink ? std::make_shared<const Sink>(std::move(sink)) : nullptr;
+  Lock lock(state().mutex);
+  state().sink.swap(next);
+}
+
+}  // namespace log
+
+void VeltraLogging::startLogging(std::string_view program, std::string_view facility) {
+  using log::Target;
+  const std::string_view choice = log::environment("VELTRA_LOG_TARGET", "auto");
+  const std::string_view level = log::environment("VELTRA_LOG", "info");
+  const auto kind = log::kindForChoice(choice);
+  const auto threshold = log::levelForName(level);
+
+  ::tzset();  // localtime_r alone does not read the zone
+  const int number = facility == "Daemon" ? LOG_DAEMON : log::kUserFacility;
+  auto target = std::make_shared<const Target>(
+      Target{kind ? *kind : *log::kindForChoice("auto"), std::string(program), number});
+  if (target->kind == Target::Kind::syslog) ::openlog(target->program.c_str(), LOG_PID, number);
+  log::exchangeTarget(std::move(target));
+  log::threshold = static_cast<int>(threshold.value_or(LogLevel::info));
+
+  if (!kind) {
+    logWarning("VELTRA_LOG_TARGET is \"%s\": expected auto, stderr or syslog; using auto",
+               std::string(choice).c_str());
+  }
+  if (!threshold) {
+    logWarning("VELTRA_LOG is \"%s\": expected error, warning, info or debug; using info",
+               std::string(level).c_str());
+  }
+}
+
+void VeltraLogging::stopLogging() {
+  const auto last = log::exchangeTarget(std::make_shared<const log::Target>());
+  if (last->kind == log::Target::Kind::syslog) ::closelog();
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,13 @@
+// The 48-bit linear congruential sequence, started from zero. Any thread.
+#include "platform/random.h"
+
+#include <stdlib.h>
+
+namespace veltrad::platform {
+
+double UnseededSequence::uniform() {
+  Lock lock(_mutex);
+  return ::erand48(_state);
+}
+
+}  // namespace veltrad::platform
