@@ -1,5 +1,6 @@
-// Property lists, binary (version "bplist00") and XML, both directions. Pure functions from bytes to values and
-// back; any thread. Format: a trailer-first table of offsets, and the XML document type "plist" version 1.0.
+// Property lists, binary (version "bplist00") and XML, both directions. Pure functions from bytes to values
+// and back; any thread. Format: a trailer-first table of offsets, and the XML document type "plist"
+// version 1.0.
 #pragma once
 
 #include <string>
@@ -10,13 +11,13 @@
 
 namespace veltrad {
 
-// What a reader spends at most on one property list; whatever the bytes say, nothing is allocated from a count
-// that the list declares before it was checked against the bytes that are there.
+// What a reader spends at most on one property list; whatever the bytes say, nothing is allocated from a
+// count that the list declares before it was checked against the bytes that are there.
 struct PropertyListLimits {
-  std::size_t bytes = 64u << 20;    // length of the whole list
-  int depth = 64;                   // nesting of arrays and dictionaries, the outermost being 1
-  std::size_t objects = 100'000;    // values made, a shared object counted at each place where it stands
-  std::size_t textBytes = 8u << 20; // bytes of all keys, texts and data made, shared ones at each place
+  std::size_t bytes = 64u << 20;     // length of the whole list
+  int depth = 64;                    // nesting of arrays and dictionaries, the outermost being 1
+  std::size_t objects = 65'536;      // values made, a shared object counted at each place where it stands
+  std::size_t textBytes = 6u << 20;  // bytes of all keys, texts and data made, shared ones at each place
 };
 
 struct PropertyListError {
@@ -24,19 +25,21 @@ struct PropertyListError {
     notAPropertyList,  // neither form
     malformed,         // the form is broken; detail says where
     tooDeep,
-    tooLarge,          // bytes, objects or text beyond the limits
+    tooLarge,  // bytes, objects or text beyond the limits
     cyclic,
-    forbidden,         // XML: a document type with an internal subset, an entity, an external reference
+    forbidden,  // XML: a document type with an internal subset, an entity, an external reference
   };
   Kind kind;
   std::string detail;  // one line for the log: what is wrong and where
 };
 
 // Either form, told apart by the first bytes.
-Result<Value, PropertyListError> parsePropertyList(std::string_view bytes, const PropertyListLimits& limits = {});
+Result<Value, PropertyListError> parsePropertyList(std::string_view bytes,
+                                                   const PropertyListLimits& limits = {});
 Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
                                                          const PropertyListLimits& limits = {});
-Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes, const PropertyListLimits& limits = {});
+Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes,
+                                                      const PropertyListLimits& limits = {});
 
 std::string writeBinaryPropertyList(const Value& value);
 // Appends to `out`, so that a caller can put a header in front without a copy.

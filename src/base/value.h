@@ -54,6 +54,7 @@ class Value {
 
   // Exactly this type, else null. The pointer lives as long as this value.
   const std::string* asString() const { return std::get_if<std::string>(&_held); }
+  const double* asReal() const { return std::get_if<double>(&_held); }
   const Date* asDate() const { return std::get_if<Date>(&_held); }
   const Data* asData() const;
   const Array* asArray() const;

@@ -1,0 +1,411 @@
+// Reads binary property lists that nobody vouches for. Any thread.
+//
+// Layout: "bplist00", the objects, a table of their offsets, and a trailer of 32 bytes that says where the
+// table is and how wide offsets and references are. All numbers are big-endian.
+#include <fmt/format.h>
+
+#include <bit>
+#include <cstring>
+#include <limits>
+
+#include "base/property_list.h"
+#include "base/property_list_binary.h"
+#include "base/text.h"
+
+namespace veltrad {
+
+namespace {
+
+using namespace binary_property_list;
+using Kind = PropertyListError::Kind;
+
+std::uint64_t bigEndian(const char* at, std::size_t size) {
+  std::uint64_t number = 0;
+  for (std::size_t i = 0; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
+  return number;
+}
+
+char16_t unitAt(std::string_view bytes, std::size_t i) {
+  return static_cast<char16_t>(bigEndian(bytes.data() + 2 * i, 2));
+}
+
+// Calls `take` with every character of a big-endian UTF-16 text; a lone surrogate is U+FFFD.
+template <typename Take>
+void forEachCharacter(std::string_view bytes, Take take) {
+  const std::size_t units = bytes.size() / 2;
+  for (std::size_t i = 0; i < units; ++i) {
+    const char32_t unit = unitAt(bytes, i);
+    if (unit < 0xD800 || unit > 0xDFFF) {
+      take(unit);
+      continue;
+    }
+    const char32_t next = i + 1 < units ? unitAt(bytes, i + 1) : 0;
+    if (unit <= 0xDBFF && next >= 0xDC00 && next <= 0xDFFF) {
+      take(0x10000 + ((unit - 0xD800) << 10) + (next - 0xDC00));
+      ++i;
+    } else {
+      take(kReplacementCharacter);
+    }
+  }
+}
+
+std::size_t utf8Length(std::string_view utf16) {
+  std::size_t length = 0;
+  forEachCharacter(utf16, [&](char32_t code) {
+    length += code < 0x80 ? 1u : code < 0x800 ? 2u : code < 0x10000 ? 3u : 4u;
+  });
+  return length;
+}
+
+// Reads one list. On the caller's stack; the bytes outlive it.
+class Reader {
+ public:
+  Reader(std::string_view bytes, const PropertyListLimits& limits)
+      : _bytes(bytes), _objectsLeft(limits.objects), _textLeft(limits.textBytes), _depthLimit(limits.depth) {}
+
+  Result<Value, PropertyListError> read() {
+    Value value(false);
+    if (!readTrailer() || !charge(1) || !readObject(_top, nullptr, 1, value))
+      return Failure{std::move(_error)};
+    return value;
+  }
+
+ private:
+  // The containers that are being read, from the innermost outwards.
+  struct Path {
+    std::uint64_t object;
+    const Path* outer;
+  };
+  // An object's place: its marker, and what follows it in the object area.
+  struct Object {
+    std::uint64_t number;
+    std::uint8_t marker;
+    std::string_view rest;
+  };
+
+  bool fail(Kind kind, std::string detail) {
+    _error = {kind, std::move(detail)};
+    return false;
+  }
+  bool malformed(const Object& object, const char* what) {
+    return fail(Kind::malformed, fmt::format("object {}: {}", object.number, what));
+  }
+
+  bool readTrailer();
+  bool charge(std::uint64_t objects);
+  bool chargeText(std::uint64_t bytes);
+  bool locate(std::uint64_t number, Object& object);
+  bool takeCount(Object& object, std::uint64_t& count);
+  bool take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes);
+
+  bool readObject(std::uint64_t number, const Path* path, int depth, Value& value);
+  bool readSimple(const Object& object, Value& value);
+  bool readInteger(Object& object, Value& value);
+  bool readReal(Object& object, Value& value);
+  bool readDate(Object& object, Value& value);
+  bool readUID(Object& object, Value& value);
+  bool readData(Object& object, Value& value);
+  bool readText(Object& object, std::string& text);
+  bool readKey(std::uint64_t number, std::string& key);
+  bool enter(const Object& object, const Path* path, int depth);
+  bool readArray(Object& object, const Path* path, int depth, Value& value);
+  bool readDictionary(Object& object, const Path* path, int depth, Value& value);
+  bool isNull(std::uint64_t number, bool& null);
+
+  std::uint64_t reference(std::string_view references, std::uint64_t i) const {
+    return bigEndian(references.data() + i * _referenceSize, _referenceSize);
+  }
+
+  const std::string_view _bytes;
+  std::uint64_t _objectsLeft;
+  std::uint64_t _textLeft;
+  const int _depthLimit;
+  std::size_t _offsetSize = 0;
+  std::size_t _referenceSize = 0;
+  std::uint64_t _count = 0;
+  std::uint64_t _top = 0;
+  std::uint64_t _table = 0;  // where the object area ends and the table of offsets begins
+  PropertyListError _error{};
+};
+
+bool Reader::readTrailer() {
+  if (_bytes.size() < kHeader.size() + 1 + 1 + kTrailerSize) {
+    return fail(Kind::malformed, fmt::format("{} bytes are too few for a binary list", _bytes.size()));
+  }
+  const std::uint64_t end = _bytes.size() - kTrailerSize;
+  const char* trailer = _bytes.data() + end;
+  _offsetSize = static_cast<std::uint8_t>(trailer[6]);
+  _referenceSize = static_cast<std::uint8_t>(trailer[7]);
+  _count = bigEndian(trailer + 8, 8);
+  _top = bigEndian(trailer + 16, 8);
+  _table = bigEndian(trailer + 24, 8);
+  if (_offsetSize < 1 || _offsetSize > 8 || _referenceSize < 1 || _referenceSize > 8) {
+    return fail(Kind::malformed,
+                fmt::format("trailer: offsets of {} and references of {} bytes, 1 to 8 expected", _offsetSize,
+                            _referenceSize));
+  }
+  if (_table <= kHeader.size() || _table >= end) {
+    return fail(Kind::malformed,
+                fmt::format("trailer: the table at {} lies outside the {} bytes before it", _table, end));
+  }
+  if (_count == 0 || _count > (end - _table) / _offsetSize) {
+    return fail(Kind::malformed,
+                fmt::format("trailer: {} objects in a table of {} bytes", _count, end - _table));
+  }
+  if (_top >= _count) {
+    return fail(Kind::malformed, fmt::format("trailer: object {} is the top of {} objects", _top, _count));
+  }
+  return true;
+}
+
+bool Reader::charge(std::uint64_t objects) {
+  if (objects > _objectsLeft) return fail(Kind::tooLarge, "more objects than the limit");
+  _objectsLeft -= objects;
+  return true;
+}
+
+bool Reader::chargeText(std::uint64_t bytes) {
+  if (bytes > _textLeft) return fail(Kind::tooLarge, "more bytes of texts and data than the limit");
+  _textLeft -= bytes;
+  return true;
+}
+
+bool Reader::locate(std::uint64_t number, Object& object) {
+  if (number >= _count) {
+    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
+  }
+  const std::uint64_t offset = bigEndian(_bytes.data() + _table + number * _offsetSize, _offsetSize);
+  if (offset < kHeader.size() || offset >= _table) {
+    return fail(Kind::malformed,
+                fmt::format("object {}: offset {} lies outside the objects", number, offset));
+  }
+  object.number = number;
+  object.marker = static_cast<std::uint8_t>(_bytes[offset]);
+  object.rest = std::string_view(_bytes.data() + offset + 1, _table - offset - 1);
+  return true;
+}
+
+// The count of a marker: its low half, or an integer object right behind it when that is 15.
+bool Reader::takeCount(Object& object, std::uint64_t& count) {
+  count = object.marker & 0xFu;
+  if (count != 0xF) return true;
+  const std::uint8_t marker = object.rest.empty() ? 0 : static_cast<std::uint8_t>(object.rest[0]);
+  const std::size_t size = std::size_t{1} << (marker & 0x7);
+  if ((marker & 0xF8) != kInteger || size > 8 || object.rest.size() < 1 + size) {
+    return malformed(object, "no integer where its count should be");
+  }
+  count = bigEndian(object.rest.data() + 1, size);
+  object.rest.remove_prefix(1 + size);
+  return true;
+}
+
+bool Reader::take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes) {
+  if (count > object.rest.size() / width) return malformed(object, "it reaches beyond the objects");
+  bytes = object.rest.substr(0, count * width);
+  return true;
+}
+
+bool Reader::readObject(std::uint64_t number, const Path* path, int depth, Value& value) {
+  Object object{};
+  if (!locate(number, object)) return false;
+  switch (object.marker & 0xF0) {
+    case kSimple:
+      return readSimple(object, value);
+    case kInteger:
+      return readInteger(object, value);
+    case kReal:
+      return readReal(object, value);
+    case kDate & 0xF0:
+      return readDate(object, value);
+    case kData:
+      return readData(object, value);
+    case kASCII:
+    case kUTF16: {
+      std::string text;
+      if (!readText(object, text)) return false;
+      value = Value(std::move(text));
+      return true;
+    }
+    case kUID:
+      return readUID(object, value);
+    case kArray:
+    case kSet:
+      return readArray(object, path, depth, value);
+    case kDictionary:
+      return readDictionary(object, path, depth, value);
+    default:
+      return malformed(object, "unknown type");
+  }
+}
+
+bool Reader::readSimple(const Object& object, Value& value) {
+  if (object.marker != kFalse && object.marker != kTrue) {
+    return malformed(object, object.marker == kNull ? "a null outside a dictionary" : "unknown type");
+  }
+  value = Value(object.marker == kTrue);
+  return true;
+}
+
+bool Reader::readInteger(Object& object, Value& value) {
+  const unsigned exponent = object.marker & 0xFu;
+  if (exponent > 4) return malformed(object, "an integer of more than 16 bytes");
+  std::string_view bytes;
+  if (!take(object, 1, std::size_t{1} << exponent, bytes)) return false;
+  if (exponent < 4) {
+    // 1, 2 and 4 bytes are unsigned, 8 signed.
+    value = Value(static_cast<std::int64_t>(bigEndian(bytes.data(), bytes.size())));
+    return true;
+  }
+  const std::uint64_t high = bigEndian(bytes.data(), 8);
+  const std::uint64_t low = bigEndian(bytes.data() + 8, 8);
+  const auto asSigned = static_cast<std::int64_t>(low);
+  if (high == (asSigned < 0 ? ~std::uint64_t{0} : 0)) {
+    value = Value(asSigned);
+  } else if (high == 0) {
+    value = Value(low);
+  } else {
+    return malformed(object, "an integer beyond 64 bits");
+  }
+  return true;
+}
+
+bool Reader::readReal(Object& object, Value& value) {
+  const std::size_t size = std::size_t{1} << (object.marker & 0x7u);
+  if ((object.marker & 0x8u) || (size != 4 && size != 8))
+    return malformed(object, "a real of neither 4 nor 8 bytes");
+  std::string_view bytes;
+  if (!take(object, 1, size, bytes)) return false;
+  const std::uint64_t bits = bigEndian(bytes.data(), size);
+  value = size == 8 ? Value(std::bit_cast<double>(bits))
+                    : Value(static_cast<double>(std::bit_cast<float>(static_cast<std::uint32_t>(bits))));
+  return true;
+}
+
+bool Reader::readDate(Object& object, Value& value) {
+  if (object.marker != kDate) return malformed(object, "unknown type");
+  std::string_view bytes;
+  if (!take(object, 1, 8, bytes)) return false;
+  value = Value(Date{std::bit_cast<double>(bigEndian(bytes.data(), 8)) + kSecondsFrom1970To2001});
+  return true;
+}
+
+bool Reader::readUID(Object& object, Value& value) {
+  const std::size_t size = (object.marker & 0xFu) + std::size_t{1};
+  if (size > 8) return malformed(object, "an identifier beyond 64 bits");
+  std::string_view bytes;
+  if (!take(object, 1, size, bytes)) return false;
+  value = Value(bigEndian(bytes.data(), size));
+  return true;
+}
+
+bool Reader::readData(Object& object, Value& value) {
+  std::uint64_t count = 0;
+  std::string_view bytes;
+  if (!takeCount(object, count) || !take(object, count, 1, bytes) || !chargeText(count)) return false;
+  value = Value(Data{std::string(bytes)});
+  return true;
+}
+
+bool Reader::readText(Object& object, std::string& text) {
+  const bool wide = (object.marker & 0xF0) == kUTF16;
+  std::uint64_t count = 0;
+  std::string_view bytes;
+  if (!takeCount(object, count) || !take(object, count, wide ? 2 : 1, bytes)) return false;
+  if (!wide) {
+    if (!isASCII(bytes)) return malformed(object, "a byte above 127 in an ASCII text");
+    if (!chargeText(count)) return false;
+    text.assign(bytes);
+    return true;
+  }
+  if (count > _textLeft) return chargeText(count);
+  const std::size_t length = utf8Length(bytes);
+  if (!chargeText(length)) return false;
+  text.reserve(length);
+  forEachCharacter(bytes, [&](char32_t code) { appendUTF8(text, code); });
+  return true;
+}
+
+bool Reader::readKey(std::uint64_t number, std::string& key) {
+  Object object{};
+  if (!locate(number, object)) return false;
+  const std::uint8_t type = object.marker & 0xF0;
+  if (type != kASCII && type != kUTF16) return malformed(object, "a key that is no text");
+  return readText(object, key);
+}
+
+bool Reader::enter(const Object& object, const Path* path, int depth) {
+  for (; path; path = path->outer) {
+    if (path->object == object.number) {
+      return fail(Kind::cyclic, fmt::format("object {} contains itself", object.number));
+    }
+  }
+  if (depth > _depthLimit) return fail(Kind::tooDeep, fmt::format("nested deeper than {}", _depthLimit));
+  return true;
+}
+
+bool Reader::readArray(Object& object, const Path* path, int depth, Value& value) {
+  std::uint64_t count = 0;
+  std::string_view references;
+  // The children are paid for before room is made for them.
+  if (!enter(object, path, depth) || !takeCount(object, count) ||
+      !take(object, count, _referenceSize, references) || !charge(count)) {
+    return false;
+  }
+  const Path here{object.number, path};
+  Array array;
+  array.reserve(count);
+  for (std::uint64_t i = 0; i < count; ++i) {
+    if (!readObject(reference(references, i), &here, depth + 1, array.emplace_back(false))) return false;
+  }
+  value = Value(std::move(array));
+  return true;
+}
+
+bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& value) {
+  std::uint64_t count = 0;
+  std::string_view references;
+  if (!enter(object, path, depth) || !takeCount(object, count) ||
+      !take(object, count, 2 * _referenceSize, references) || !charge(2 * count)) {
+    return false;
+  }
+  const Path here{object.number, path};
+  std::vector<Dictionary::Entry> entries;
+  entries.reserve(count);
+  for (std::uint64_t i = 0; i < count; ++i) {
+    auto& entry = entries.emplace_back(std::string(), false);
+    if (!readKey(reference(references, i), entry.first)) return false;
+    const std::uint64_t number = reference(references, count + i);
+    bool null = false;
+    if (!isNull(number, null)) return false;
+    if (null) {
+      entries.pop_back();
+    } else if (!readObject(number, &here, depth + 1, entry.second)) {
+      return false;
+    }
+  }
+  value = Value(Dictionary::fromEntries(std::move(entries)));
+  return true;
+}
+
+bool Reader::isNull(std::uint64_t number, bool& null) {
+  Object object{};
+  if (!locate(number, object)) return false;
+  null = object.marker == kNull;
+  return true;
+}
+
+}  // namespace
+
+Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
+                                                         const PropertyListLimits& limits) {
+  if (!bytes.starts_with(kHeader)) {
+    return Failure{PropertyListError{Kind::notAPropertyList, "it does not begin with \"bplist00\""}};
+  }
+  if (bytes.size() > limits.bytes) {
+    return Failure{PropertyListError{
+        Kind::tooLarge, fmt::format("{} bytes, at most {} are read", bytes.size(), limits.bytes)}};
+  }
+  return Reader(bytes, limits).read();
+}
+
+}  // namespace veltrad
