@@ -34,10 +34,10 @@ class SigningKey {
   std::shared_ptr<evp_pkey_st> _key;
 };
 
-// The container around the bag bytes as they are: a property list in XML form with the base64 texts
-// "signature" and "bag".
-std::string makeStorebagContainer(const SigningKey& key, std::string_view bag);
-// The same around the storebag written as a property list in XML form.
+// The container around the storebag, written as a property list in XML form: itself one, with the base64
+// texts "signature" and "bag".
 std::string makeStorebagContainer(const SigningKey& key, const Dictionary& storebag);
+// The same around bag bytes as they are.
+std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag);
 
 }  // namespace veltrad

@@ -1,0 +1,39 @@
+// From the bytes of a storebag container to the storebag. Pure functions; any thread.
+#include "config/storebag_container.h"
+
+#include "base/base64.h"
+
+namespace veltrad {
+namespace {
+
+std::optional<std::string> textUnder(const Dictionary& dictionary, std::string_view key) {
+  const std::string* text = dictionary.string(key);
+  return text != nullptr ? std::optional(*text) : std::nullopt;
+}
+
+}  // namespace
+
+Result<StorebagContainer, PropertyListError> parseStorebagContainer(std::string_view bytes) {
+  const auto list = parsePropertyList(bytes, kStorebagContainerLimits);
+  if (!list) return Failure{list.error()};
+  const Dictionary* dictionary = list.value().asDictionary();
+  if (dictionary == nullptr) return StorebagContainer{};
+  return StorebagContainer{textUnder(*dictionary, "signature"), textUnder(*dictionary, "bag")};
+}
+
+std::optional<SignedStorebag> decodeStorebagContainer(const StorebagContainer& container) {
+  if (!container.signature || !container.bag) return std::nullopt;
+  std::optional<std::string> signature = decodeBase64(*container.signature);
+  if (!signature) return std::nullopt;
+  std::optional<std::string> bag = decodeBase64(*container.bag);
+  if (!bag) return std::nullopt;
+  return SignedStorebag{std::move(*signature), std::move(*bag)};
+}
+
+std::optional<Dictionary> parseStorebagBag(std::string_view bag) {
+  const auto list = parsePropertyList(bag, kStorebagBagLimits);
+  const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
+  return dictionary != nullptr ? std::optional(*dictionary) : std::nullopt;
+}
+
+}  // namespace veltrad

@@ -1,0 +1,133 @@
+// Downloads one storebag and verifies its signature. Runs on the caller's thread.
+#include "config/storebag_download.h"
+
+#include <algorithm>
+#include <chrono>
+#include <limits>
+
+#include "config/process_settings.h"
+#include "config/storebag_container.h"
+#include "config/storebag_key.h"
+#include "platform/http_client.h"
+#include "platform/log.h"
+#include "protocol/veltra.h"
+
+namespace veltrad {
+namespace {
+
+constexpr std::chrono::milliseconds kStorebagTimeout{15'000};
+constexpr std::int32_t kDefaultMaxAgeSeconds = 86'400;
+constexpr const char* kNameWithDefault = "quindle";
+
+// Digits after an optional sign, whatever follows; no digits: 0. Kept within 32 bits.
+std::int32_t leadingInteger(std::string_view text) {
+  constexpr std::int64_t kMost = std::numeric_limits<std::int32_t>::max();
+  const bool negative = text.starts_with('-');
+  if (negative || text.starts_with('+')) text.remove_prefix(1);
+  std::int64_t number = 0;
+  for (const char c : text) {
+    if (c < '0' || c > '9') break;
+    number = std::min(number * 10 + (c - '0'), kMost + 1);
+  }
+  return static_cast<std::int32_t>(negative ? -number : std::min(number, kMost));
+}
+
+platform::HTTPRequest requestForStorebag(std::string url, const std::optional<std::string>* lastModified) {
+  platform::HTTPRequest request;
+  request.method = platform::HTTPRequest::Method::get;
+  request.lane = platform::HTTPRequest::Lane::storebag;
+  request.url = std::move(url);
+  request.timeout = kStorebagTimeout;
+  request.mostResponseBytes = kStorebagMostContainerBytes;
+  if (lastModified != nullptr && *lastModified) {
+    logDebug("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header", (*lastModified)->c_str());
+    request.headers.emplace_back("If-Modified-Since", **lastModified);
+  }
+  return request;
+}
+
+// True when the server says that the cached storebag is current; otherwise the slot has taken the answer's
+// text.
+bool isNotModified(const platform::HTTPResponse& response, std::optional<std::string>& lastModified) {
+  const std::optional<std::string_view> header = response.header("Last-Modified");
+  if (!header) return false;
+  if (response.body.empty() && lastModified) {
+    logDebug("fetchStorebagWithName: storebag content has not changed. using its cached version");
+    return true;
+  }
+  lastModified = std::string(*header);
+  logDebug("fetchStorebagWithName: New 'Last-Modified: %s' received", lastModified->c_str());
+  return false;
+}
+
+}  // namespace
+
+std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl) {
+  if (!cacheControl) return kDefaultMaxAgeSeconds;
+  std::string_view rest = *cacheControl;
+  for (;;) {
+    const std::size_t end = rest.find_first_of("= ");
+    if (end == std::string_view::npos) return kDefaultMaxAgeSeconds;
+    const bool found = rest.substr(0, end) == "max-age";
+    rest.remove_prefix(end + 1);
+    if (found) return leadingInteger(rest.substr(0, rest.find_first_of("= ")));
+  }
+}
+
+Dictionary defaultStorebag() {
+  const Dictionary section{{"mivo", Dictionary{{"active", true}}}};
+  return Dictionary{{"florn_internal", section},
+                    {"development", section},
+                    {"release", section},
+                    {"version", "1.0.0-Quindle-Fallback"},
+                    {"refresh_cycle", 3600}};
+}
+
+StorebagDownload::StorebagDownload(platform::HTTPClient& http, ProcessSettings& settings,
+                                   const Veltra& veltra)
+    : _http(http), _settings(settings), _veltra(veltra) {}
+
+std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::string& name,
+                                                                  std::int32_t& maxAge, bool& notModified,
+                                                                  std::optional<std::string>* lastModified) {
+  const std::string url = _settings.storebagServerURL() + "/" + name + "?version=" + _veltra.packageVersion();
+  logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
+  const platform::HTTPResult answer = _http.perform(requestForStorebag(url, lastModified));
+  if (!answer) {
+    logInfo("fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
+            url.c_str(), answer.error().description.c_str());
+    if (name != kNameWithDefault) return std::nullopt;
+    logInfo("fetchStorebagWithName: Loading default storebag '%s'", name.c_str());
+    return defaultStorebag();
+  }
+  const platform::HTTPResponse& response = answer.value();
+  maxAge = maxAgeOfCacheControl(response.header("Cache-Control"));
+  if (lastModified != nullptr && isNotModified(response, *lastModified)) {
+    notModified = true;
+    return std::nullopt;
+  }
+  return verifiedStorebag(response.body);
+}
+
+std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view body) const {
+  const auto container = parseStorebagContainer(body);
+  if (!container)
+    logError("fetchStorebagWithName: propertyListWithData error %s", container.error().detail.c_str());
+  if (!container || !container.value().signature) {
+    logError("fetchStorebagWithName: Signature is missing");
+    return std::nullopt;
+  }
+  const std::optional<std::string> der = _veltra.publicKeyDER();
+  if (!der) return std::nullopt;
+  const std::optional<StorebagKey> key = StorebagKey::fromDER(*der);
+  if (!key) return std::nullopt;
+  const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
+  if (!decoded) return std::nullopt;
+  if (!key->verifies(decoded->bag, decoded->signature)) {
+    logError("fetchStorebagWithName: Signature can not be verified, %p", key->identity());
+    return std::nullopt;
+  }
+  return parseStorebagBag(decoded->bag);
+}
+
+}  // namespace veltrad

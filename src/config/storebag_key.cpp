@@ -1,0 +1,115 @@
+// RSA verification with OpenSSL's EVP: never a verify without a digest, never padding parsed by hand. Any
+// thread.
+#include "config/storebag_key.h"
+
+#include <openssl/bn.h>
+#include <openssl/core_names.h>
+#include <openssl/decoder.h>
+#include <openssl/err.h>
+#include <openssl/evp.h>
+#include <openssl/provider.h>
+#include <openssl/rsa.h>
+
+namespace veltrad {
+namespace {
+
+template <auto Free>
+struct Deleter {
+  template <typename T>
+  void operator()(T* object) const {
+    Free(object);
+  }
+};
+using LibraryContext = std::unique_ptr<OSSL_LIB_CTX, Deleter<OSSL_LIB_CTX_free>>;
+using Provider = std::unique_ptr<OSSL_PROVIDER, Deleter<OSSL_PROVIDER_unload>>;
+using Key = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
+using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
+using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
+using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
+
+const unsigned char* bytesOf(std::string_view text) {
+  return reinterpret_cast<const unsigned char*>(text.data());
+}
+
+// A refusal is no error of the thread's: others read the same queue.
+class ErrorQueueAsItWas {
+ public:
+  ErrorQueueAsItWas() { ERR_set_mark(); }
+  ~ErrorQueueAsItWas() { ERR_pop_to_mark(); }
+};
+
+Key decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
+  EVP_PKEY* key = nullptr;
+  const Decoder decoder(
+      OSSL_DECODER_CTX_new_for_pkey(&key, "DER", structure, "RSA", EVP_PKEY_PUBLIC_KEY, library, nullptr));
+  const unsigned char* at = bytesOf(der);
+  std::size_t left = der.size();
+  const bool decoded = decoder != nullptr && OSSL_DECODER_from_data(decoder.get(), &at, &left) == 1;
+  Key held(key);
+  return decoded && left == 0 ? std::move(held) : nullptr;
+}
+
+bool isUsable(const EVP_PKEY* key) {
+  if (EVP_PKEY_is_a(key, "RSA") != 1) return false;
+  const int bits = EVP_PKEY_get_bits(key);
+  if (bits < StorebagKey::kFewestModulusBits || bits > StorebagKey::kMostModulusBits) return false;
+  // Under an exponent of 1 every padded digest is its own signature.
+  BIGNUM* exponent = nullptr;
+  if (EVP_PKEY_get_bn_param(key, OSSL_PKEY_PARAM_RSA_E, &exponent) != 1) return false;
+  const Number held(exponent);
+  return BN_is_odd(exponent) == 1 && BN_is_one(exponent) != 1;
+}
+
+}  // namespace
+
+// In this order: the key goes first when it is freed.
+struct StorebagKey::Held {
+  LibraryContext library;
+  Provider provider;
+  Key key;
+};
+
+StorebagKey::StorebagKey(std::unique_ptr<Held> held) : _held(std::move(held)) {}
+StorebagKey::StorebagKey(StorebagKey&&) noexcept = default;
+StorebagKey& StorebagKey::operator=(StorebagKey&&) noexcept = default;
+StorebagKey::~StorebagKey() = default;
+
+std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {
+  const ErrorQueueAsItWas errors;
+  auto held = std::make_unique<Held>();
+  held->library.reset(OSSL_LIB_CTX_new());
+  if (!held->library) return std::nullopt;
+  held->provider.reset(OSSL_PROVIDER_load(held->library.get(), "default"));
+  if (!held->provider) return std::nullopt;
+  held->key = decodeKey(der, "SubjectPublicKeyInfo", held->library.get());
+  if (!held->key) held->key = decodeKey(der, "type-specific", held->library.get());
+  if (!held->key || !isUsable(held->key.get())) return std::nullopt;
+  return StorebagKey(std::move(held));
+}
+
+bool StorebagKey::verifies(std::string_view bag, std::string_view signature) const {
+  const ErrorQueueAsItWas errors;
+  EVP_PKEY* key = _held->key.get();
+  if (signature.size() != static_cast<std::size_t>(EVP_PKEY_get_size(key))) return false;
+  const DigestContext context(EVP_MD_CTX_new());
+  EVP_PKEY_CTX* settings = nullptr;  // owned by `context`
+  return context != nullptr &&
+         EVP_DigestVerifyInit_ex(context.get(), &settings, "SHA1", _held->library.get(), nullptr, key,
+                                 nullptr) == 1 &&
+         EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1 &&
+         EVP_DigestVerify(context.get(), bytesOf(signature), signature.size(), bytesOf(bag), bag.size()) == 1;
+}
+
+int StorebagKey::modulusBits() const {
+  return EVP_PKEY_get_bits(_held->key.get());
+}
+const void* StorebagKey::identity() const {
+  return _held->key.get();
+}
+
+bool verifySignature(std::string_view publicKeyDER, std::string_view bag, std::string_view signature) {
+  const std::optional<StorebagKey> key = StorebagKey::fromDER(publicKeyDER);
+  return key && key->verifies(bag, signature);
+}
+
+}  // namespace veltrad
