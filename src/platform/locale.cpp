@@ -1,0 +1,66 @@
+// Country and time zone from the process's environment. Any thread; the environment does not change after
+// start.
+#include "platform/locale.h"
+
+#include <time.h>
+
+#include <cstdlib>
+#include <string_view>
+
+#include "platform/environment_file.h"
+#include "platform/file_store.h"
+
+namespace veltrad::platform {
+
+namespace {
+
+bool isLetter(char c) {
+  return (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
+}
+bool isDigit(char c) {
+  return c >= '0' && c <= '9';
+}
+char upperCase(char c) {
+  return c >= 'a' && c <= 'z' ? static_cast<char>(c - 'a' + 'A') : c;
+}
+
+}  // namespace
+
+// LANGUAGE[_COUNTRY][.CODESET][@MODIFIER]; a country is two letters (ISO 3166) or three digits (UN M.49).
+std::optional<std::string> countryOfLocaleName(const std::string& name) {
+  const auto underscore = name.find('_');
+  if (underscore == std::string::npos || underscore == 0) return std::nullopt;
+  const auto end = name.find_first_of(".@", underscore);
+  if (name.find_first_of(".@") < underscore) return std::nullopt;
+  std::string country = name.substr(underscore + 1, end == std::string::npos ? end : end - underscore - 1);
+  const bool letters = country.size() == 2 && isLetter(country[0]) && isLetter(country[1]);
+  const bool digits =
+      country.size() == 3 && isDigit(country[0]) && isDigit(country[1]) && isDigit(country[2]);
+  if (!letters && !digits) return std::nullopt;
+  for (char& c : country) c = upperCase(c);
+  return country;
+}
+
+EnvironmentLocale::EnvironmentLocale(FileStore& files, std::string localeConfigurationPath)
+    : _files(files), _path(std::move(localeConfigurationPath)) {}
+
+std::optional<std::string> EnvironmentLocale::countryCode() {
+  for (const char* variable : {"LC_ALL", "LC_MESSAGES", "LANG"}) {
+    const char* name = std::getenv(variable);
+    if (name && *name) return countryOfLocaleName(name);
+  }
+  const auto configuration = _files.read(_path, 64u << 10);
+  if (!configuration) return std::nullopt;
+  const auto name = valueInEnvironmentFile(configuration.value(), "LANG");
+  return name ? countryOfLocaleName(*name) : std::nullopt;
+}
+
+int EnvironmentLocale::timeZoneOffset() {
+  ::tzset();  // localtime_r alone does not see a changed zone
+  const time_t now = ::time(nullptr);
+  tm parts{};
+  ::localtime_r(&now, &parts);
+  return static_cast<int>(parts.tm_gmtoff);
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,50 @@
+// The client library's facts, from its resources and the preferences. Any thread.
+#include "protocol/veltra.h"
+
+#include "base/property_list.h"
+#include "platform/file_store.h"
+#include "platform/log.h"
+#include "platform/preferences.h"
+#include "platform/root.h"
+#include "platform/uuid.h"
+
+namespace veltrad {
+
+namespace {
+constexpr const char* kVersionWhenNoneStated = "8.0";
+constexpr std::size_t kMostResourceBytes = 1u << 20;
+}  // namespace
+
+Veltra::Veltra(platform::FileStore& files, platform::Preferences& preferences, const platform::Root& root)
+    : _files(files),
+      _preferences(preferences),
+      _manifestPath(root.packageManifestPath()),
+      _publicKeyPath(root.publicKeyPath()) {}
+
+std::string Veltra::packageVersion() const {
+  const auto bytes = _files.read(_manifestPath, kMostResourceBytes);
+  if (!bytes) return kVersionWhenNoneStated;
+  const auto list = parsePropertyList(bytes.value());
+  if (!list) {
+    logWarning("The package manifest states no version: %s: %s", _manifestPath.c_str(),
+               list.error().detail.c_str());
+    return kVersionWhenNoneStated;
+  }
+  const Dictionary* manifest = list.value().asDictionary();
+  const std::string* version = manifest ? manifest->string("version") : nullptr;
+  return version && !version->empty() ? *version : kVersionWhenNoneStated;
+}
+
+std::optional<std::string> Veltra::publicKeyDER() const {
+  auto bytes = _files.read(_publicKeyPath, kMostResourceBytes);
+  if (!bytes) return std::nullopt;
+  return std::move(bytes).value();
+}
+
+std::string Veltra::getPersistentIdentifierForDNU(bool respectDNU) const {
+  return _preferences.textOrStore(platform::kVeltraPreferenceDomain,
+                                  respectDNU ? "uuidRespectDNU" : "uuidOverrideDNU",
+                                  platform::randomUUIDText);
+}
+
+}  // namespace veltrad
