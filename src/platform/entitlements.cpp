@@ -1,0 +1,130 @@
+// The rules of who may do what. Any thread; the file is reread when it changed.
+#include "platform/entitlements.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "base/property_list.h"
+#include "platform/file_store.h"
+#include "platform/log.h"
+
+namespace veltrad::platform {
+
+namespace {
+
+// An id exactly: no boolean, no real, nothing that would have to be wrapped.
+std::optional<unsigned> idOf(const Value& value) {
+  if (value.type() != Value::Type::signedInteger && value.type() != Value::Type::unsignedInteger)
+    return std::nullopt;
+  const auto number = value.toInt64();
+  if (!number || *number < 0 || *number >= 0xffff'ffff) return std::nullopt;
+  return static_cast<unsigned>(*number);
+}
+
+// A condition of the wrong type is never met: read as absent, it would make the rule wider.
+bool matches(const Dictionary& rule, const Peer& peer) {
+  const Value* uid = rule.find("uid");
+  const Value* gid = rule.find("gid");
+  const Value* unit = rule.find("unit");
+  if (!uid && !gid && !unit) return false;
+  if (uid && idOf(*uid) != peer.uid) return false;
+  if (gid) {
+    const auto wanted = idOf(*gid);
+    if (!wanted || std::find(peer.gids.begin(), peer.gids.end(), *wanted) == peer.gids.end()) return false;
+  }
+  if (unit) {
+    const std::string* wanted = unit->asString();
+    if (!wanted || !peer.unit || *wanted != *peer.unit) return false;
+  }
+  return true;
+}
+
+// Why the rule can never grant anything; nothing when it can.
+std::optional<std::string> problemOf(const Value& value) {
+  const Dictionary* rule = value.asDictionary();
+  if (!rule) return "expected a dictionary";
+  const Value* uid = rule->find("uid");
+  const Value* gid = rule->find("gid");
+  const Value* unit = rule->find("unit");
+  if (!uid && !gid && !unit) return "expected \"uid\", \"gid\" or \"unit\"";
+  if (uid && !idOf(*uid)) return "\"uid\" is no user id, expected an integer";
+  if (gid && !idOf(*gid)) return "\"gid\" is no group id, expected an integer";
+  if (unit && !unit->asString()) return "\"unit\" is no text, expected a unit's name";
+  if (!rule->dictionary("entitlements")) return "expected a dictionary under \"entitlements\"";
+  return std::nullopt;
+}
+
+struct ReadRules {
+  Array rules;
+  std::optional<std::string> error;
+  std::vector<std::string> warnings;
+};
+
+ReadRules readRules(FileStore& files, const std::string& path) {
+  ReadRules read;
+  const auto bytes = files.read(path);
+  if (!bytes) {
+    if (bytes.error().kind != FileFailure::Kind::notFound) read.error = bytes.error().description;
+    return read;
+  }
+  const auto list = parsePropertyList(bytes.value());
+  const Array* rules = list ? list.value().asArray() : nullptr;
+  if (!rules) {
+    read.error = path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
+    return read;
+  }
+  read.rules = *rules;
+  bool namesUnits = false;
+  for (std::size_t i = 0; i < rules->size(); ++i) {
+    const Value& rule = (*rules)[i];
+    if (const auto problem = problemOf(rule)) {
+      read.warnings.push_back(path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
+    } else {
+      namesUnits = namesUnits || rule.asDictionary()->contains("unit");
+    }
+  }
+  if (namesUnits && !kernelTellsUnits()) {
+    read.warnings.push_back(path +
+                            ": rules with \"unit\" never match, this kernel does not tell a peer's process");
+  }
+  return read;
+}
+
+}  // namespace
+
+std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer) {
+  for (const Value& value : rules) {
+    const Dictionary* rule = value.asDictionary();
+    if (!rule || !matches(*rule, peer)) continue;
+    const Dictionary* entitlements = rule->dictionary("entitlements");
+    if (const Value* found = entitlements ? entitlements->find(name) : nullptr) return *found;
+  }
+  return std::nullopt;
+}
+
+Entitlements::Entitlements(FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
+
+std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {
+  std::optional<std::string> error;
+  std::vector<std::string> warnings;
+  std::optional<Value> found;
+  {
+    Lock lock(_mutex);
+    // The stamp comes first: a file that changes while it is read is read again.
+    const auto stamp = _files.stamp(_path);
+    if (!_read || stamp != _stamp) {
+      ReadRules fresh = readRules(_files, _path);
+      _rules = std::move(fresh.rules);
+      error = std::move(fresh.error);
+      warnings = std::move(fresh.warnings);
+      _stamp = stamp;
+      _read = true;
+    }
+    found = entitlementInRules(_rules, name, peer);
+  }
+  if (error) logError("Entitlements could not be read, nothing is granted: %s", error->c_str());
+  for (const std::string& warning : warnings) logWarning("Entitlements: %s", warning.c_str());
+  return found;
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,101 @@
+// The main run loop over a signal descriptor and a wake-up descriptor. Main thread; stop() from any.
+#include "platform/run_loop.h"
+
+#include <poll.h>
+#include <signal.h>
+#include <sys/eventfd.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
+#include <cstdlib>
+#include <optional>
+
+namespace veltrad::platform {
+
+namespace {
+
+sigset_t setOf(std::initializer_list<int> signals) {
+  sigset_t set;
+  ::sigemptyset(&set);
+  for (const int signal : signals) ::sigaddset(&set, signal);
+  return set;
+}
+
+extern "C" void endAtOnce(int) {
+  ::_exit(1);
+}
+
+void letASecondSignalEndTheProcess() {
+  struct sigaction action {};
+  action.sa_handler = endAtOnce;
+  ::sigaction(SIGTERM, &action, nullptr);
+  ::sigaction(SIGINT, &action, nullptr);
+  const sigset_t ending = setOf({SIGTERM, SIGINT});
+  ::pthread_sigmask(SIG_UNBLOCK, &ending, nullptr);
+}
+
+// The signal that ends the loop, when one has come. SIGHUP asks for nothing: files are reread when they
+// change.
+std::optional<int> endingSignal(int descriptor) {
+  signalfd_siginfo information{};
+  while (::read(descriptor, &information, sizeof information) == static_cast<ssize_t>(sizeof information)) {
+    const int signal = static_cast<int>(information.ssi_signo);
+    if (signal == SIGTERM || signal == SIGINT) return signal;
+  }
+  return std::nullopt;
+}
+
+}  // namespace
+
+RunLoop::RunLoop() : _wakeup(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+  if (_wakeup < 0) std::abort();
+}
+
+RunLoop::~RunLoop() {
+  ::close(_wakeup);
+  if (_signals >= 0) ::close(_signals);
+}
+
+void RunLoop::blockSignals() {
+  ::signal(SIGPIPE, SIG_IGN);
+  const sigset_t set = setOf({SIGTERM, SIGINT, SIGHUP});
+  ::pthread_sigmask(SIG_BLOCK, &set, nullptr);
+  if (_signals < 0) _signals = ::signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
+  if (_signals < 0) std::abort();
+}
+
+int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>& tick) {
+  using SteadyClock = std::chrono::steady_clock;
+  auto next = SteadyClock::now() + interval;
+  int signal = 0;
+  while (true) {
+    pollfd descriptors[] = {{_signals, POLLIN, 0}, {_wakeup, POLLIN, 0}};
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(next - SteadyClock::now()).count();
+    const int ready = ::poll(descriptors, std::size(descriptors),
+                             static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000)));
+    if (ready < 0 && errno != EINTR) std::abort();
+    if (ready > 0 && descriptors[0].revents != 0) {
+      if (const auto ending = endingSignal(_signals)) {
+        signal = *ending;
+        break;
+      }
+    }
+    if (ready > 0 && descriptors[1].revents != 0) break;
+    if (SteadyClock::now() < next) continue;
+    tick();
+    next = std::max(next + interval, SteadyClock::now());  // a late tick is not made up for by several
+  }
+  letASecondSignalEndTheProcess();
+  return signal;
+}
+
+void RunLoop::stop() {
+  const std::uint64_t one = 1;
+  // The counter is full only where a wake-up is waiting already.
+  if (::write(_wakeup, &one, sizeof one) < 0 && errno != EAGAIN) std::abort();
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,20 @@
+// The transaction as the service manager's STATUS text. Any thread.
+#include "platform/transaction.h"
+
+#include <cstdlib>
+
+#include "platform/service_manager.h"
+
+namespace veltrad::platform {
+
+void ServiceTransaction::open() {
+  if (_isOpen.exchange(true)) std::abort();
+  _manager.status("Serving sessions");
+}
+
+void ServiceTransaction::close() {
+  if (!_isOpen.exchange(false)) std::abort();
+  _manager.status("Idle: no sessions");
+}
+
+}  // namespace veltrad::platform
