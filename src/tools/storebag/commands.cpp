@@ -1,0 +1,171 @@
+// What the commands of veltra-storebag do. One thread.
+#include "storebag/commands.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <optional>
+
+#include "base/json.h"
+#include "base/property_list.h"
+#include "config/storebag_container.h"
+#include "config/storebag_key.h"
+#include "platform/file_store.h"
+#include "storebag/signing.h"
+
+namespace veltrad::storebag {
+namespace {
+
+using platform::DiskFileStore;
+
+Outcome done(std::string text) {
+  return {true, std::move(text)};
+}
+Outcome refused(std::string text) {
+  return {false, std::move(text)};
+}
+
+bool exists(const std::string& path) {
+  struct stat found {};
+  return ::lstat(path.c_str(), &found) == 0;
+}
+
+// Never replaces a file, not even one that appeared meanwhile.
+std::optional<std::string> writeNew(const std::string& path, const std::string& bytes, mode_t mode) {
+  const int descriptor = ::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
+  if (descriptor < 0) return path + ": " + std::strerror(errno);
+  const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
+  const bool whole = written == static_cast<ssize_t>(bytes.size()) && ::fsync(descriptor) == 0;
+  ::close(descriptor);
+  if (whole) return std::nullopt;
+  ::unlink(path.c_str());
+  return path + ": could not be written";
+}
+
+// A storebag as it lies in a file, and the bytes to sign for it.
+struct Bag {
+  Value content;
+  std::string bytes;
+};
+
+bool startsLikeJSON(std::string_view bytes) {
+  const std::size_t first = bytes.find_first_not_of(" \t\r\n");
+  return first != std::string_view::npos && (bytes[first] == '{' || bytes[first] == '[');
+}
+
+// Limits of both readers: the daemon's own are checked by sign().
+Result<Bag, std::string> readBag(const std::string& path) {
+  DiskFileStore files;
+  auto bytes = files.read(path, PropertyListLimits{}.bytes);
+  if (!bytes) return Failure{bytes.error().description};
+  if (startsLikeJSON(bytes.value())) {
+    auto json = parseJSON(bytes.value());
+    if (!json)
+      return Failure{fmt::format("{}: JSON, byte {}: {}", path, json.error().offset, json.error().detail)};
+    std::string list = writeXMLPropertyList(json.value());
+    return Bag{std::move(json).value(), std::move(list)};
+  }
+  auto list = parsePropertyList(bytes.value());
+  if (!list) {
+    if (list.error().kind == PropertyListError::Kind::notAPropertyList)
+      return Failure{path + ": neither a property list nor JSON"};
+    return Failure{path + ": " + list.error().detail};
+  }
+  return Bag{std::move(list).value(), std::move(bytes).value()};
+}
+
+std::string bounds() {
+  return fmt::format("at most {} bytes, {} levels and {} values", kStorebagBagLimits.bytes,
+                     kStorebagBagLimits.depth, kStorebagBagLimits.objects);
+}
+
+}  // namespace
+
+Outcome keygen(const std::string& directory, int bits) {
+  const std::string privatePath = directory + "/" + kPrivateKeyFile;
+  const std::string publicPath = directory + "/" + kPublicKeyFile;
+  for (const std::string& path : {privatePath, publicPath})
+    if (exists(path)) return refused(path + ": exists already; keys are never overwritten");
+  if (const auto failure = platform::makeDirectories(directory)) return refused(failure->description);
+  const SigningKey key = SigningKey::generate(bits);
+  if (const auto failure = writeNew(privatePath, key.privatePEM(), 0600)) return refused(*failure);
+  if (const auto failure = writeNew(publicPath, key.publicDER(), 0644)) {
+    ::unlink(privatePath.c_str());
+    return refused(*failure);
+  }
+  return done(fmt::format("{}\n{}\n", privatePath, publicPath));
+}
+
+Outcome sign(const std::string& privateKey, const std::string& in, const std::string& out) {
+  const auto key = SigningKey::load(privateKey);
+  if (!key) return refused(key.error());
+  const auto bag = readBag(in);
+  if (!bag) return refused(bag.error());
+  if (bag.value().content.asDictionary() == nullptr)
+    return refused(in + ": the storebag is no dictionary at its top level");
+  if (!parseStorebagBag(bag.value().bytes))
+    return refused(fmt::format("{}: beyond what the daemon takes of a storebag: {}", in, bounds()));
+  const std::string container = makeStorebagContainerAround(key.value(), bag.value().bytes);
+  if (!parseStorebagContainer(container))
+    return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", in, container.size(),
+                               kStorebagMostContainerBytes));
+  DiskFileStore files;
+  if (const auto failure = files.replace(out, container, 0644)) return refused(failure->description);
+  return done("");
+}
+
+Outcome verify(const std::string& publicKey, const std::string& file) {
+  DiskFileStore files;
+  const auto der = files.read(publicKey, kStorebagMostContainerBytes);
+  if (!der) return refused(der.error().description);
+  const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
+  if (!key)
+    return refused(fmt::format("{}: expected an RSA public key in DER form of {} to {} bits", publicKey,
+                               StorebagKey::kFewestModulusBits, StorebagKey::kMostModulusBits));
+  const auto bytes = files.read(file, kStorebagMostContainerBytes);
+  if (!bytes) return refused(bytes.error().description);
+  const auto container = parseStorebagContainer(bytes.value());
+  if (!container) return refused(file + ": the container is no property list: " + container.error().detail);
+  if (!container.value().signature) return refused(file + ": the text \"signature\" is missing");
+  if (!container.value().bag) return refused(file + ": the text \"bag\" is missing");
+  const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
+  if (!decoded) return refused(file + ": \"signature\" or \"bag\" is no base64");
+  const std::size_t expected = static_cast<std::size_t>(key->modulusBits() + 7) / 8;
+  if (decoded->signature.size() != expected)
+    return refused(fmt::format("{}: the signature has {} bytes; one of this key has {}", file,
+                               decoded->signature.size(), expected));
+  if (!key->verifies(decoded->bag, decoded->signature))
+    return refused(file + ": the signature is not this key's over this bag");
+  if (!parseStorebagBag(decoded->bag))
+    return refused(
+        fmt::format("{}: signed, but the bag is no property list of a dictionary within {}", file, bounds()));
+  return done(file + ": the signature holds\n");
+}
+
+Outcome show(const std::string& file, bool compact) {
+  const auto bag = readBag(file);
+  if (!bag) return refused(bag.error());
+  const Dictionary* content = bag.value().content.asDictionary();
+  if (content == nullptr) return refused(file + ": no dictionary at its top level");
+  Dictionary storebag = *content;
+  // A storebag's own entries are dictionaries, its version and its refresh cycle: "bag" as a text is a
+  // container's.
+  if (const std::string* text = content->string("bag")) {
+    const auto decoded = decodeStorebagContainer({std::string(), *text});
+    if (!decoded) return refused(file + ": \"bag\" is no base64");
+    const auto inner = parseStorebagBag(decoded->bag);
+    if (!inner)
+      return refused(
+          fmt::format("{}: the bag is no property list of a dictionary within {}", file, bounds()));
+    storebag = *inner;
+  }
+  std::string json = writeJSON(storebag, compact ? JSONStyle::compact : JSONStyle::pretty);
+  if (!json.ends_with('\n')) json += '\n';
+  return done(std::move(json));
+}
+
+}  // namespace veltrad::storebag

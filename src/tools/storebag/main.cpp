@@ -1,0 +1,72 @@
+// veltra-storebag: makes keys, signs storebags, verifies and shows them. One thread. Exit status: 0 done, 1
+// refused or failed, 2 wrong usage; results on standard output, everything else on standard error.
+#include <CLI/CLI.hpp>
+#include <cstdio>
+#include <exception>
+#include <string>
+
+#include "storebag/commands.h"
+#include "storebag/signing.h"
+
+namespace {
+
+using veltrad::SigningKey;
+using veltrad::storebag::Outcome;
+
+struct Arguments {
+  std::string directory, key, in, out, file;
+  int bits = SigningKey::kFewestBits;
+  bool json = false;
+  Outcome outcome;
+};
+
+void describe(CLI::App& app, Arguments& given) {
+  app.require_subcommand(1);
+  CLI::App* keygen =
+      app.add_subcommand("keygen", "Make a signing key: DIR/privateKey.pem and DIR/publicKey.der");
+  keygen->add_option("DIR", given.directory, "Where the files go; neither may exist")->required();
+  keygen->add_option("--bits", given.bits, "Length of the modulus")
+      ->check(CLI::Range(SigningKey::kFewestBits, SigningKey::kMostBits))
+      ->capture_default_str();
+  keygen->callback([&given] { given.outcome = veltrad::storebag::keygen(given.directory, given.bits); });
+
+  CLI::App* sign = app.add_subcommand("sign", "Sign a storebag");
+  sign->add_option("--key", given.key, "Private key in PEM form")->required();
+  sign->add_option("IN", given.in, "The storebag: a property list, or JSON")->required();
+  sign->add_option("-o,--output", given.out, "The container, as servers send it")->required();
+  sign->callback([&given] { given.outcome = veltrad::storebag::sign(given.key, given.in, given.out); });
+
+  CLI::App* verify = app.add_subcommand("verify", "Verify a signed storebag as the daemon does");
+  verify->add_option("--key", given.key, "Public key in DER form")->required();
+  verify->add_option("FILE", given.file, "The container")->required();
+  verify->callback([&given] { given.outcome = veltrad::storebag::verify(given.key, given.file); });
+
+  CLI::App* show = app.add_subcommand("show", "Print a storebag as JSON, without verifying it");
+  show->add_option("FILE", given.file, "A container, or a bare storebag")->required();
+  show->add_flag("--json", given.json, "In one line");
+  show->callback([&given] { given.outcome = veltrad::storebag::show(given.file, given.json); });
+}
+
+}  // namespace
+
+int main(int count, char** arguments) {
+  try {
+    CLI::App app("Makes, signs, verifies and shows storebags.", "veltra-storebag");
+    Arguments given;
+    describe(app, given);
+    try {
+      app.parse(count, arguments);
+    } catch (const CLI::ParseError& error) {
+      return app.exit(error) == 0 ? 0 : 2;
+    }
+    std::FILE* stream = given.outcome.done ? stdout : stderr;
+    const std::string text =
+        given.outcome.done ? given.outcome.text : "veltra-storebag: " + given.outcome.text + "\n";
+    const bool written =
+        std::fwrite(text.data(), 1, text.size(), stream) == text.size() && std::fflush(stream) == 0;
+    return given.outcome.done && written ? 0 : 1;
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "veltra-storebag: %s\n", error.what());
+    return 1;
+  }
+}

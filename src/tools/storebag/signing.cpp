@@ -1,0 +1,105 @@
+// Keys that sign storebags. Any thread.
+#include "storebag/signing.h"
+
+#include <openssl/bio.h>
+#include <openssl/evp.h>
+#include <openssl/pem.h>
+#include <openssl/rsa.h>
+#include <openssl/x509.h>
+
+#include <cstdio>
+#include <cstdlib>
+
+#include "base/base64.h"
+#include "base/property_list.h"
+#include "platform/file_store.h"
+
+namespace veltrad {
+namespace {
+
+using Key = std::shared_ptr<EVP_PKEY>;
+using Memory = std::unique_ptr<BIO, decltype(&BIO_free)>;
+
+constexpr std::size_t kMostKeyFileBytes = 1u << 16;
+
+[[noreturn]] void abortFor(const char* what) {
+  std::fprintf(stderr, "veltra-storebag: OpenSSL could not %s\n", what);
+  std::abort();
+}
+
+std::string contentsOf(BIO* memory) {
+  char* bytes = nullptr;
+  const long length = BIO_get_mem_data(memory, &bytes);
+  return std::string(bytes, static_cast<std::size_t>(length));
+}
+
+// Never asks for a passphrase on the terminal: an encrypted key is refused.
+int noPassphrase(char*, int, int, void*) {
+  return -1;
+}
+
+}  // namespace
+
+SigningKey::SigningKey(Key key) : _key(std::move(key)) {}
+
+SigningKey SigningKey::generate(int bits) {
+  if (bits < kFewestBits || bits > kMostBits) abortFor("make a key of that size");
+  Key key(EVP_RSA_gen(static_cast<unsigned>(bits)), EVP_PKEY_free);
+  if (!key) abortFor("make a key");
+  return SigningKey(std::move(key));
+}
+
+Result<SigningKey, std::string> SigningKey::load(const std::string& path) {
+  platform::DiskFileStore files;
+  const auto pem = files.read(path, kMostKeyFileBytes);
+  if (!pem) return Failure{pem.error().description};
+  const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())), BIO_free);
+  Key key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
+  if (!key || EVP_PKEY_is_a(key.get(), "RSA") != 1)
+    return Failure{path + ": expected an RSA private key in PEM form, not encrypted"};
+  const int bits = EVP_PKEY_get_bits(key.get());
+  if (bits < kFewestBits || bits > kMostBits)
+    return Failure{path + ": the key has " + std::to_string(bits) + " bits, expected " +
+                   std::to_string(kFewestBits) + " to " + std::to_string(kMostBits)};
+  return SigningKey(std::move(key));
+}
+
+std::string SigningKey::privatePEM() const {
+  const Memory memory(BIO_new(BIO_s_mem()), BIO_free);
+  if (PEM_write_bio_PKCS8PrivateKey(memory.get(), _key.get(), nullptr, nullptr, 0, nullptr, nullptr) != 1)
+    abortFor("write a private key");
+  return contentsOf(memory.get());
+}
+
+std::string SigningKey::publicDER() const {
+  const Memory memory(BIO_new(BIO_s_mem()), BIO_free);
+  if (i2d_PUBKEY_bio(memory.get(), _key.get()) != 1) abortFor("write a public key");
+  return contentsOf(memory.get());
+}
+
+std::string SigningKey::sign(std::string_view bag) const {
+  const std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
+  std::string signature(static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())), '\0');
+  std::size_t length = signature.size();
+  EVP_PKEY_CTX* settings = nullptr;  // owned by `context`
+  const bool isSigned =
+      context != nullptr &&
+      EVP_DigestSignInit_ex(context.get(), &settings, "SHA1", nullptr, nullptr, _key.get(), nullptr) == 1 &&
+      EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1 &&
+      EVP_DigestSign(context.get(), reinterpret_cast<unsigned char*>(signature.data()), &length,
+                     reinterpret_cast<const unsigned char*>(bag.data()), bag.size()) == 1;
+  if (!isSigned) abortFor("sign");
+  signature.resize(length);
+  return signature;
+}
+
+std::string makeStorebagContainer(const SigningKey& key, const Dictionary& storebag) {
+  return makeStorebagContainerAround(key, writeXMLPropertyList(storebag));
+}
+
+std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag) {
+  return writeXMLPropertyList(
+      Dictionary{{"signature", encodeBase64(key.sign(bag))}, {"bag", encodeBase64(bag)}});
+}
+
+}  // namespace veltrad
