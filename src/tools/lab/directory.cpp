@@ -1,0 +1,142 @@
+// The lab's directory: its certificate, its signing key, the storebags that a developer edits. Any thread.
+#include "directory.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+
+#include "base/json.h"
+#include "base/property_list.h"
+#include "certificate.h"
+#include "platform/file_store.h"
+
+namespace veltrad::lab {
+namespace {
+
+// A first storebag to look at and to change: every client reports to this lab, whatever its consent.
+constexpr std::string_view kExampleStorebag = R"({
+  "version": "example-1",
+  "release": {
+    "httppost": {
+      "display_url": "${url}/",
+      "clients": [
+        {
+          "post_url": "${url}/events",
+          "realtime_post_url": "${url}/realtime",
+          "locale_whitelist": ["US", "DE", "GB"],
+          "override_dnu": 1,
+          "sampling_threshold": 1,
+          "event_threshold": 49,
+          "filters": [{"key": "userName", "action": "sha256"}]
+        }
+      ]
+    }
+  }
+}
+)";
+
+bool exists(const std::string& path) {
+  return ::access(path.c_str(), F_OK) == 0;
+}
+
+std::string replaced(std::string text, std::string_view what, const std::string& by) {
+  for (auto at = text.find(what); at != std::string::npos; at = text.find(what, at + by.size()))
+    text.replace(at, what.size(), by);
+  return text;
+}
+
+// As deep as the parsers let it be.
+Value withURL(const Value& value, const std::string& url) {
+  if (const auto* text = value.asString()) return replaced(*text, "${url}", url);
+  if (const auto* array = value.asArray()) {
+    Array changed;
+    for (const auto& item : *array) changed.push_back(withURL(item, url));
+    return changed;
+  }
+  if (const auto* dictionary = value.asDictionary()) {
+    std::vector<Dictionary::Entry> changed;
+    for (const auto& [key, item] : *dictionary) changed.emplace_back(key, withURL(item, url));
+    return Dictionary::fromEntries(std::move(changed));
+  }
+  return value;
+}
+
+// A name is one path component of letters, digits, "-" and "_": it never leaves the directory.
+bool isStorebagName(const std::string& name) {
+  const auto plain = [](unsigned char c) { return std::isalnum(c) != 0 || c == '-' || c == '_'; };
+  return !name.empty() && std::all_of(name.begin(), name.end(), plain);
+}
+
+Result<Value, std::string> parsed(const std::string& bytes, bool json) {
+  if (json) {
+    auto value = parseJSON(bytes);
+    if (value) return std::move(value).value();
+    return Failure{"no JSON at byte " + std::to_string(value.error().offset) + ": " + value.error().detail};
+  }
+  auto value = parsePropertyList(bytes);
+  if (value) return std::move(value).value();
+  return Failure{"no property list: " + value.error().detail};
+}
+
+std::optional<std::string> makeSigningKey(const std::string& privatePath, const std::string& publicPath) {
+  platform::DiskFileStore files;
+  if (!exists(privatePath)) {
+    if (const auto failure = files.replace(privatePath, SigningKey::generate().privatePEM(), 0600))
+      return failure->description;
+  }
+  const auto key = SigningKey::load(privatePath);
+  if (!key) return key.error();
+  if (const auto failure = files.replace(publicPath, key.value().publicDER(), 0644))
+    return failure->description;
+  return std::nullopt;
+}
+
+}  // namespace
+
+Result<Directory, std::string> Directory::open(const std::string& path) {
+  const bool first = !exists(path + "/storebags");
+  for (const char* part : {"/storebags", "/received", "/signing"}) {
+    if (const auto failure = platform::makeDirectories(path + part)) return Failure{failure->description};
+  }
+  platform::DiskFileStore files;
+  if (first) {
+    if (const auto failure = files.replace(path + "/storebags/quindle.json", kExampleStorebag, 0644))
+      return Failure{failure->description};
+  }
+  const std::string privatePath = path + "/signing/private.pem";
+  if (const auto failure = makeSigningKey(privatePath, path + "/signing/publicKey.der"))
+    return Failure{*failure};
+  auto key = SigningKey::load(privatePath);
+  if (!key) return Failure{key.error()};
+  Directory directory(path, std::move(key).value());
+  if (!exists(directory.certificatePath()) || !exists(directory.certificateKeyPath())) {
+    if (const auto failure = makeCertificate(directory.certificatePath(), directory.certificateKeyPath()))
+      return Failure{*failure};
+  }
+  return directory;
+}
+
+Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& name,
+                                                          const std::string& url) const {
+  using Kind = StorebagFailure::Kind;
+  if (!isStorebagName(name))
+    return Failure{StorebagFailure{Kind::notFound, "a storebag's name has letters, digits, - and _ only"}};
+  const std::string base = _path + "/storebags/" + name;
+  const bool json = !exists(base + ".plist");
+  const std::string path = base + (json ? ".json" : ".plist");
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0)
+    return Failure{StorebagFailure{Kind::notFound, "neither " + base + ".plist nor .json is there"}};
+  platform::DiskFileStore files;
+  const auto bytes = files.read(path, 16u << 20);
+  if (!bytes) return Failure{StorebagFailure{Kind::unreadable, bytes.error().description}};
+  const auto value = parsed(bytes.value(), json);
+  if (!value) return Failure{StorebagFailure{Kind::unreadable, path + ": " + value.error()}};
+  const Value changed = withURL(value.value(), url);
+  if (!changed.asDictionary())
+    return Failure{StorebagFailure{Kind::unreadable, path + ": a storebag is a dictionary at its top"}};
+  return StorebagFile{*changed.asDictionary(), status.st_mtim.tv_sec};
+}
+
+}  // namespace veltrad::lab

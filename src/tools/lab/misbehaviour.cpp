@@ -1,0 +1,154 @@
+// How the lab has been told to misbehave: rules, each for the requests below a path. Any thread.
+#include "misbehaviour.h"
+
+#include <algorithm>
+
+#include "base/json.h"
+
+namespace veltrad::lab {
+namespace {
+
+// Each reader says what it expected, or nothing when the value was read.
+using Wrong = std::optional<std::string>;
+
+Wrong readText(const Value& value, std::string& into) {
+  const std::string* text = value.asString();
+  if (!text) return "a text";
+  into = *text;
+  return std::nullopt;
+}
+
+Wrong readBoolean(const Value& value, bool& into) {
+  if (!value.isBoolean()) return "true or false";
+  into = *value.toBoolean();
+  return std::nullopt;
+}
+
+Wrong readInteger(const Value& value, std::int64_t least, std::int64_t most, std::int64_t& into) {
+  const auto number = value.isNumber() ? value.toInt64() : std::nullopt;
+  if (!number || *number < least || *number > most)
+    return "an integer from " + std::to_string(least) + " to " + std::to_string(most);
+  into = *number;
+  return std::nullopt;
+}
+
+Wrong readSignature(const Value& value, Rule::Signature& into) {
+  const std::string* text = value.asString();
+  if (text && *text == "wrong")
+    into = Rule::Signature::wrong;
+  else if (text && *text == "missing")
+    into = Rule::Signature::missing;
+  else if (text && *text == "none")
+    into = Rule::Signature::none;
+  else
+    return R"("wrong", "missing" or "none")";
+  return std::nullopt;
+}
+
+Wrong readHeaders(const Value& value, Dictionary& into) {
+  const Dictionary* headers = value.asDictionary();
+  const auto isText = [](const Dictionary::Entry& entry) { return entry.second.asString() != nullptr; };
+  if (!headers || !std::all_of(headers->begin(), headers->end(), isText)) return "an object of texts";
+  into = *headers;
+  return std::nullopt;
+}
+
+Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
+  std::int64_t number = 0;
+  Wrong wrong;
+  if (key == "path") return readText(value, rule.path);
+  if (key == "cut") return readBoolean(value, rule.cut);
+  if (key == "cutHalfway") return readBoolean(value, rule.cutHalfway);
+  if (key == "stall") return readBoolean(value, rule.stall);
+  if (key == "endless") return readBoolean(value, rule.endless);
+  if (key == "lastModified") return readBoolean(value, rule.lastModified);
+  if (key == "sign") return readSignature(value, rule.sign);
+  if (key == "headers") return readHeaders(value, rule.headers);
+  if (key == "body") return readText(value, rule.body.emplace());
+  if (key == "times") {
+    wrong = readInteger(value, 1, 1'000'000'000, number);
+    rule.times = number;
+  } else if (key == "status") {
+    wrong = readInteger(value, 200, 599, number);
+    rule.status = static_cast<int>(number);
+  } else if (key == "delayMs") {
+    wrong = readInteger(value, 0, 3'600'000, number);
+    rule.delay = std::chrono::milliseconds(number);
+  } else {
+    return "one of path, times, status, delayMs, cut, cutHalfway, stall, endless, sign, lastModified, "
+           "headers, body";
+  }
+  return wrong;
+}
+
+}  // namespace
+
+Result<Rule, std::string> ruleFromJSON(std::string_view text) {
+  const auto parsed = parseJSON(text);
+  if (!parsed)
+    return Failure{"no JSON at byte " + std::to_string(parsed.error().offset) + ": " + parsed.error().detail};
+  const Dictionary* entries = parsed.value().asDictionary();
+  if (!entries)
+    return Failure{std::string(R"(expected a JSON object, for instance {"path": "/events", "status": 503})")};
+  Rule rule;
+  for (const auto& [key, value] : *entries) {
+    if (const Wrong expected = readEntry(key, value, rule))
+      return Failure{"\"" + key + "\": expected " + *expected};
+  }
+  return rule;
+}
+
+void Misbehaviour::add(Rule rule) {
+  const Lock hold(_mutex);
+  std::erase_if(_rules, [&](const Rule& other) { return other.path == rule.path; });
+  _rules.push_back(std::move(rule));
+}
+
+std::optional<Rule> Misbehaviour::take(std::string_view path) {
+  const Lock hold(_mutex);
+  auto best = _rules.end();
+  for (auto rule = _rules.begin(); rule != _rules.end(); ++rule) {
+    if (path.starts_with(rule->path) && (best == _rules.end() || rule->path.size() > best->path.size()))
+      best = rule;
+  }
+  if (best == _rules.end()) return std::nullopt;
+  const Rule taken = *best;
+  if (best->times && --*best->times == 0) _rules.erase(best);
+  return taken;
+}
+
+void Misbehaviour::reset() {
+  const Lock hold(_mutex);
+  _rules.clear();
+  ++_generation;
+  _changed.notifyAll();
+}
+
+void Misbehaviour::stop() {
+  const Lock hold(_mutex);
+  _rules.clear();
+  ++_generation;
+  _stopped = true;
+  _changed.notifyAll();
+}
+
+bool Misbehaviour::hold(std::optional<std::chrono::milliseconds> time) {
+  const auto until = std::chrono::steady_clock::now() + time.value_or(std::chrono::hours(24 * 365));
+  const Lock hold(_mutex);
+  const std::uint64_t before = _generation;
+  while (!_stopped && _generation == before && std::chrono::steady_clock::now() < until)
+    _changed.waitUntil(_mutex, until);
+  return !_stopped && _generation == before;
+}
+
+bool Misbehaviour::stopped() const {
+  const Lock hold(_mutex);
+  return _stopped;
+}
+
+std::uint64_t Misbehaviour::generation() const {
+  const Lock hold(_mutex);
+  return _generation;
+}
+
+}  // namespace veltrad::lab

@@ -1,0 +1,266 @@
+// The lab's HTTPS server: storebags, the event collector, control and the live page. The only file that
+// includes the HTTP library; its threads run the handlers.
+#include "server.h"
+
+#include <httplib.h>
+
+#include <charconv>
+#include <thread>
+
+#include "base/text.h"
+#include "connections.h"
+#include "page.h"
+
+namespace veltrad::lab {
+namespace {
+
+constexpr std::size_t kMostBodyBytes = 64u << 20;
+constexpr std::size_t kThreads = 64;  // each open connection holds one
+constexpr std::size_t kPieceBytes = 64u << 10;
+constexpr std::chrono::milliseconds kLongestWait{60'000};
+constexpr const char* kPlainText = "text/plain; charset=utf-8";
+
+double now() {
+  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
+// Without those that the library adds for itself.
+Dictionary headersOf(const httplib::Request& request) {
+  Dictionary headers;
+  for (const auto& [name, text] : request.headers) {
+    if (name == "REMOTE_ADDR" || name == "REMOTE_PORT" || name == "LOCAL_ADDR" || name == "LOCAL_PORT")
+      continue;
+    const std::string* before = headers.string(name);
+    headers.set(name, before ? *before + ", " + toUTF8(text) : toUTF8(text));
+  }
+  return headers;
+}
+
+Dictionary arrival(const httplib::Request& request) {
+  return {{"time", now()},
+          {"path", toUTF8(request.target)},
+          {"method", request.method},
+          {"headers", headersOf(request)}};
+}
+
+// What became of the request, for who reads the lines.
+std::string outcome(const std::optional<Rule>& rule, const Answer& answer) {
+  if (rule && rule->stall) return "stalled";
+  if (rule && rule->cut) return "cut";
+  return std::to_string(answer.status);
+}
+
+std::uint64_t numberOf(const httplib::Request& request, const char* parameter) {
+  const std::string text = request.get_param_value(parameter);
+  std::uint64_t number = 0;
+  std::from_chars(text.data(), text.data() + text.size(), number);
+  return number;
+}
+
+void refuse(httplib::Response& response, int status, const std::string& why) {
+  response.status = status;
+  response.set_content(why + "\n", kPlainText);
+}
+
+}  // namespace
+
+struct Server::Library {
+  explicit Library(Server& server)
+      : lab(server), http([this](SSL_CTX& context) { return useCertificate(context); }) {}
+
+  bool useCertificate(SSL_CTX& context);
+  void route();
+  void storebag(const httplib::Request& request, httplib::Response& response);
+  void collect(const httplib::Request& request, httplib::Response& response,
+               const httplib::ContentReader& reader);
+  void control(const httplib::Request& request, httplib::Response& response, const std::string& body);
+  void received(const httplib::Request& request, httplib::Response& response);
+  void send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
+            const std::optional<Rule>& rule);
+  void sendEndless(httplib::Response& response, const std::string& type);
+
+  Server& lab;
+  Connections connections;  // before the server, whose context it watches
+  httplib::SSLServer http;
+  std::thread accepting;
+  std::atomic<bool> failed{false};
+};
+
+bool Server::Library::useCertificate(SSL_CTX& context) {
+  connections.watch(context);
+  return SSL_CTX_set_min_proto_version(&context, TLS1_2_VERSION) == 1 &&
+         SSL_CTX_use_certificate_chain_file(&context, lab._directory.certificatePath().c_str()) == 1 &&
+         SSL_CTX_use_PrivateKey_file(&context, lab._directory.certificateKeyPath().c_str(),
+                                     SSL_FILETYPE_PEM) == 1 &&
+         SSL_CTX_check_private_key(&context) == 1;
+}
+
+void Server::Library::route() {
+  using Request = httplib::Request;
+  using Response = httplib::Response;
+  http.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
+  http.set_keep_alive_max_count(1'000'000'000);
+  http.set_keep_alive_timeout(60);
+  http.set_payload_max_length(kMostBodyBytes);
+  http.set_tcp_nodelay(true);
+  http.set_exception_handler([](const Request&, Response& response, std::exception_ptr) {
+    refuse(response, 500, "the lab could not handle this request");
+  });
+  http.Get("/", [this](const Request&, Response& response) {
+    response.set_content(livePage(lab._url, lab._events, lab._storebags), "text/html; charset=utf-8");
+  });
+  http.Get("/received", [this](const Request& request, Response& response) { received(request, response); });
+  http.Get("/.+", [this](const Request& request, Response& response) { storebag(request, response); });
+  const auto collector = [this](const Request& request, Response& response,
+                                const httplib::ContentReader& reader) { collect(request, response, reader); };
+  http.Post("/.*", collector);
+  http.Put("/.*", collector);
+  http.Delete("/control", [this](const Request&, Response& response) {
+    lab._misbehaviour.reset();
+    response.set_content("{}", "application/json");
+  });
+}
+
+void Server::Library::storebag(const httplib::Request& request, httplib::Response& response) {
+  const std::string name = request.path.substr(request.path.rfind('/') + 1);
+  const auto rule = lab._misbehaviour.take(request.path);
+  const auto file = lab._directory.storebag(name, lab._url);
+  Answer answer = file ? answerWithStorebag(file.value(), lab._directory.signingKey(),
+                                            rule ? rule->sign : Rule::Signature::right, lab._maxAge,
+                                            request.get_header_value("If-Modified-Since"))
+                       : answerWithFailure(file.error());
+  if (rule) applyRule(*rule, answer);
+  Dictionary line = arrival(request);
+  line.set("name", toUTF8(name));
+  line.set("outcome", outcome(rule, answer));
+  lab._storebags.add(line, {});
+  send(request, response, answer, rule);
+}
+
+void Server::Library::collect(const httplib::Request& request, httplib::Response& response,
+                              const httplib::ContentReader& reader) {
+  std::string body;  // the library has undone the gzip
+  const bool whole = reader([&body](const char* bytes, std::size_t length) {
+    if (body.size() + length > kMostBodyBytes) return false;
+    body.append(bytes, length);
+    return true;
+  });
+  if (!whole) {
+    Connections::endAfterAnswer(request.ssl);
+    const bool tooLarge = response.status == 413 || body.size() + kPieceBytes > kMostBodyBytes;
+    return refuse(response, tooLarge ? 413 : 400,
+                  tooLarge ? "a body has at most 64 MiB" : "the body is cut short or is no gzip");
+  }
+  if (request.path == "/control") return control(request, response, body);
+  const auto rule = lab._misbehaviour.take(request.path);
+  Answer answer;
+  answer.body = "{}";
+  if (rule) applyRule(*rule, answer);
+  Dictionary line = arrival(request);
+  const std::string length = request.get_header_value("Content-Length");
+  line.set("compressed", request.get_header_value("Content-Encoding") == "gzip");
+  line.set("bytes", length.empty() ? std::uint64_t{body.size()}
+                                   : std::uint64_t{std::strtoull(length.c_str(), nullptr, 10)});
+  line.set("outcome", outcome(rule, answer));
+  lab._events.add(line, bodyAsJSON(body));
+  send(request, response, answer, rule);
+}
+
+void Server::Library::control(const httplib::Request&, httplib::Response& response, const std::string& body) {
+  auto rule = ruleFromJSON(body);
+  if (!rule) return refuse(response, 400, rule.error());
+  lab._misbehaviour.add(std::move(rule).value());
+  response.set_content("{}", "application/json");
+}
+
+// ?kind=events|storebags, and with &count=N&waitMs=M only once N lines have come or M milliseconds are over.
+void Server::Library::received(const httplib::Request& request, httplib::Response& response) {
+  const std::string kind = request.get_param_value("kind");
+  if (kind != "events" && kind != "storebags")
+    return refuse(response, 400, "kind: expected events or storebags");
+  Received& lines = kind == "events" ? lab._events : lab._storebags;
+  const auto wait = std::min<std::uint64_t>(numberOf(request, "waitMs"), kLongestWait.count());
+  lines.waitFor(numberOf(request, "count"), std::chrono::milliseconds(wait));
+  const std::uint64_t first = lines.firstByte();
+  const std::uint64_t length = lines.endByte() - first;
+  if (length == 0) return response.set_content("", "application/x-ndjson");
+  response.set_content_provider(
+      length, "application/x-ndjson",
+      [&lines, first](std::size_t offset, std::size_t most, httplib::DataSink& sink) {
+        const auto bytes = lines.read(first + offset, std::min(most, kPieceBytes));
+        return !bytes.empty() && sink.write(bytes.data(), bytes.size());
+      });
+}
+
+void Server::Library::send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
+                           const std::optional<Rule>& rule) {
+  response.status = answer.status;
+  if (rule && rule->delay.count() > 0) lab._misbehaviour.hold(rule->delay);
+  if (rule && rule->stall) lab._misbehaviour.hold(std::nullopt);
+  if (rule && (rule->cut || (rule->stall && lab._misbehaviour.stopped())))
+    return Connections::cut(request.ssl);
+  for (const auto& [name, text] : answer.headers) response.set_header(name, text.toText().value_or(""));
+  if (rule && rule->endless) return sendEndless(response, answer.type);
+  if (rule && rule->cutHalfway) {
+    response.set_content_provider(
+        std::max<std::size_t>(answer.body.size(), 2), answer.type,
+        [body = answer.body](std::size_t, std::size_t most, httplib::DataSink& sink) {
+          const std::string half = body.substr(0, most / 2);
+          sink.write(half.data(), half.size());
+          return false;
+        });
+    return;
+  }
+  if (!answer.body.empty()) response.set_content(answer.body, answer.type);
+}
+
+void Server::Library::sendEndless(httplib::Response& response, const std::string& type) {
+  response.set_chunked_content_provider(
+      type, [this, piece = std::string(kPieceBytes, 'x'), generation = lab._misbehaviour.generation()](
+                std::size_t, httplib::DataSink& sink) {
+        return lab._misbehaviour.generation() == generation && sink.write(piece.data(), piece.size());
+      });
+}
+
+Server::Server(const Directory& directory, int maxAge)
+    : _directory(directory),
+      _maxAge(maxAge),
+      _events(directory.receivedPath("events")),
+      _storebags(directory.receivedPath("storebags")) {}
+
+Server::~Server() {
+  stop();
+}
+
+std::optional<std::string> Server::start(int port) {
+  for (const Received* lines : {&_events, &_storebags}) {
+    if (!lines->ok()) return lines->path() + ": cannot be opened for appending: " + std::strerror(errno);
+  }
+  _library = std::make_unique<Library>(*this);
+  auto& http = _library->http;
+  if (!http.is_valid())
+    return _directory.certificatePath() + " and its key cannot be used; remove both to have new ones made";
+  _library->route();
+  if (port == 0)
+    port = http.bind_to_any_port("127.0.0.1");
+  else if (!http.bind_to_port("127.0.0.1", port))
+    port = -1;
+  if (port < 0) return "the port is taken or may not be bound; --port 0 takes any free one";
+  _url = "https://localhost:" + std::to_string(port);
+  _library->accepting = std::thread([this] { _library->failed = !_library->http.listen_after_bind(); });
+  while (!http.is_running() && !_library->failed) std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  if (_library->failed) return "the server could not accept connections";
+  return std::nullopt;
+}
+
+void Server::stop() {
+  if (!_library || !_library->accepting.joinable()) return;
+  _misbehaviour.stop();
+  _events.stop();
+  _storebags.stop();
+  _library->connections.stop();
+  _library->http.stop();
+  _library->accepting.join();
+}
+
+}  // namespace veltrad::lab
