@@ -1,0 +1,134 @@
+// Files in memory, on a disk that can fail, fill up and lose what was not synced. Any thread.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/file_store.h"
+
+namespace veltrad::fakes {
+
+class FakeFileStore final : public platform::FileStore {
+ public:
+  using Kind = platform::FileFailure::Kind;
+
+  Result<std::string, platform::FileFailure> read(const std::string& path,
+                                                  std::size_t most = 16u << 20) override {
+    std::lock_guard lock(_mutex);
+    if (const auto failure = _readFailures.find(path); failure != _readFailures.end()) {
+      return Failure{failureOf(path, failure->second)};
+    }
+    const auto file = _files.find(path);
+    if (file == _files.end()) return Failure{failureOf(path, Kind::notFound)};
+    if (file->second.bytes.size() > most) return Failure{failureOf(path, Kind::tooLarge)};
+    return file->second.bytes;
+  }
+  std::optional<platform::FileFailure> replace(const std::string& path, std::string_view bytes,
+                                               unsigned mode = 0600) override {
+    std::lock_guard lock(_mutex);
+    if (_writeFailure) return failureOf(path, *_writeFailure);
+    _files[path] = {std::string(bytes), mode, ++_lastStamp};
+    ++_replaced;
+    if (_syncs) _synced = _files;
+    return std::nullopt;
+  }
+  std::optional<platform::FileFailure> rename(const std::string& from, const std::string& to) override {
+    std::lock_guard lock(_mutex);
+    if (_writeFailure) return failureOf(from, *_writeFailure);
+    const auto file = _files.find(from);
+    if (file == _files.end()) return failureOf(from, Kind::notFound);
+    _files[to] = file->second;
+    _files.erase(from);
+    if (_syncs) _synced = _files;
+    return std::nullopt;
+  }
+  std::optional<std::uint64_t> stamp(const std::string& path) override {
+    std::lock_guard lock(_mutex);
+    const auto file = _files.find(path);
+    return file == _files.end() ? std::nullopt : std::optional(file->second.stamp);
+  }
+
+  // What somebody else does to the disk; always synced, never fails.
+  void put(const std::string& path, std::string_view bytes) {
+    std::lock_guard lock(_mutex);
+    _files[path] = {std::string(bytes), 0644, ++_lastStamp};
+    _synced[path] = _files[path];
+  }
+  void remove(const std::string& path) {
+    std::lock_guard lock(_mutex);
+    _files.erase(path);
+    _synced.erase(path);
+  }
+  std::optional<std::string> bytes(const std::string& path) const {
+    std::lock_guard lock(_mutex);
+    const auto file = _files.find(path);
+    return file == _files.end() ? std::nullopt : std::optional(file->second.bytes);
+  }
+  unsigned mode(const std::string& path) const {
+    std::lock_guard lock(_mutex);
+    const auto file = _files.find(path);
+    return file == _files.end() ? 0 : file->second.mode;
+  }
+  int replaced() const {
+    std::lock_guard lock(_mutex);
+    return _replaced;
+  }
+
+  // From now on; nothing: all is well again.
+  void failWrites(std::optional<Kind> kind) {
+    std::lock_guard lock(_mutex);
+    _writeFailure = kind;
+  }
+  void failReads(const std::string& path, std::optional<Kind> kind) {
+    std::lock_guard lock(_mutex);
+    _readFailures.erase(path);
+    if (kind) _readFailures.emplace(path, *kind);
+  }
+  // A disk that says it has synced and has not: crash() loses what was written since.
+  void pretendToSync(bool pretend) {
+    std::lock_guard lock(_mutex);
+    _syncs = !pretend;
+  }
+  void crash() {
+    std::lock_guard lock(_mutex);
+    _files = _synced;
+  }
+
+ private:
+  struct File {
+    std::string bytes;
+    unsigned mode = 0600;
+    std::uint64_t stamp = 0;
+  };
+
+  static platform::FileFailure failureOf(const std::string& path, Kind kind) {
+    switch (kind) {
+      case Kind::notFound:
+        return {kind, path + ": No such file or directory"};
+      case Kind::noAccess:
+        return {kind, path + ": Permission denied"};
+      case Kind::tooLarge:
+        return {kind, path + ": larger than was asked for"};
+      case Kind::noSpace:
+        return {kind, path + ": No space left on device"};
+      case Kind::other:
+        break;
+    }
+    return {kind, path + ": Input/output error"};
+  }
+
+  mutable std::mutex _mutex;
+  std::map<std::string, File> _files;
+  std::map<std::string, File> _synced;
+  std::map<std::string, Kind> _readFailures;
+  std::optional<Kind> _writeFailure;
+  bool _syncs = true;
+  int _replaced = 0;
+  std::uint64_t _lastStamp = 0;
+};
+
+}  // namespace veltrad::fakes

@@ -1,0 +1,64 @@
+// Preferences in memory, which can refuse to be written. Any thread.
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "platform/preferences.h"
+
+namespace veltrad::fakes {
+
+class FakePreferences final : public platform::Preferences {
+ public:
+  std::optional<Value> value(std::string_view domain, std::string_view key) override {
+    std::lock_guard lock(_mutex);
+    const auto found = _values.find(name(domain, key));
+    return found == _values.end() ? std::nullopt : std::optional(found->second);
+  }
+  bool setValue(std::string_view domain, std::string_view key, const Value& value) override {
+    std::lock_guard lock(_mutex);
+    if (_refusesWrites) return false;
+    _values.insert_or_assign(name(domain, key), value);
+    return true;
+  }
+  std::string textOrStore(std::string_view domain, std::string_view key, std::string (*make)()) override {
+    std::lock_guard lock(_mutex);
+    auto found = _values.find(name(domain, key));
+    if (found != _values.end()) {
+      if (const auto text = found->second.toText(); text && !text->empty()) return *text;
+    }
+    const std::string made = make();
+    _values.insert_or_assign(name(domain, key), Value(made));  // as long as the process, stored or not
+    return made;
+  }
+
+  // In the domain kVeltraPreferenceDomain.
+  void set(std::string_view key, const Value& value) {
+    std::lock_guard lock(_mutex);
+    _values.insert_or_assign(name(platform::kVeltraPreferenceDomain, key), value);
+  }
+  void remove(std::string_view key) {
+    std::lock_guard lock(_mutex);
+    _values.erase(name(platform::kVeltraPreferenceDomain, key));
+  }
+  void refuseWrites(bool refuse) {
+    std::lock_guard lock(_mutex);
+    _refusesWrites = refuse;
+  }
+
+ private:
+  using Name = std::pair<std::string, std::string>;
+  static Name name(std::string_view domain, std::string_view key) {
+    return {std::string(domain), std::string(key)};
+  }
+
+  std::mutex _mutex;
+  std::map<Name, Value> _values;
+  bool _refusesWrites = false;
+};
+
+}  // namespace veltrad::fakes
