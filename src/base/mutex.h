@@ -131,4 +131,14 @@ class Condition {
   std::condition_variable _condition;
 };
 
+// The same for a RecursiveMutex that the thread holds exactly once; always in a loop around the condition.
+class RecursiveCondition {
+ public:
+  void wait(RecursiveMutex& mutex) REQUIRES(mutex) { _condition.wait(mutex); }
+  void notifyAll() { _condition.notify_all(); }
+
+ private:
+  std::condition_variable_any _condition;
+};
+
 }  // namespace veltrad

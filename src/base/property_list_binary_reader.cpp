@@ -19,9 +19,10 @@ namespace {
 using namespace binary_property_list;
 using Kind = PropertyListError::Kind;
 
+// `size` is 1 to 8.
 std::uint64_t bigEndian(const char* at, std::size_t size) {
-  std::uint64_t number = 0;
-  for (std::size_t i = 0; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
+  std::uint64_t number = static_cast<std::uint8_t>(at[0]);
+  for (std::size_t i = 1; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
   return number;
 }
 
@@ -65,8 +66,10 @@ class Reader {
 
   Result<Value, PropertyListError> read() {
     Value value(false);
-    if (!readTrailer() || !charge(1) || !readObject(_top, nullptr, 1, value))
+    Object top;
+    if (!readTrailer() || !charge(1) || !locate(_top, top) || !readObject(top, nullptr, 1, value)) {
       return Failure{std::move(_error)};
+    }
     return value;
   }
 
@@ -83,12 +86,25 @@ class Reader {
     std::string_view rest;
   };
 
-  bool fail(Kind kind, std::string detail) {
+  static bool isText(const Object& object) {
+    const std::uint8_t type = object.marker & 0xF0;
+    return type == kASCII || type == kUTF16;
+  }
+
+  [[gnu::cold]] bool fail(Kind kind, std::string detail) {
     _error = {kind, std::move(detail)};
     return false;
   }
-  bool malformed(const Object& object, const char* what) {
+  [[gnu::cold]] bool malformed(const Object& object, const char* what) {
     return fail(Kind::malformed, fmt::format("object {}: {}", object.number, what));
+  }
+
+  [[gnu::cold]] bool badReference(std::uint64_t number) {
+    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
+  }
+  [[gnu::cold]] bool badOffset(std::uint64_t number, std::uint64_t offset) {
+    return fail(Kind::malformed,
+                fmt::format("object {}: offset {} lies outside the objects", number, offset));
   }
 
   bool readTrailer();
@@ -98,7 +114,7 @@ class Reader {
   bool takeCount(Object& object, std::uint64_t& count);
   bool take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes);
 
-  bool readObject(std::uint64_t number, const Path* path, int depth, Value& value);
+  bool readObject(Object& object, const Path* path, int depth, Value& value);
   bool readSimple(const Object& object, Value& value);
   bool readInteger(Object& object, Value& value);
   bool readReal(Object& object, Value& value);
@@ -106,11 +122,9 @@ class Reader {
   bool readUID(Object& object, Value& value);
   bool readData(Object& object, Value& value);
   bool readText(Object& object, std::string& text);
-  bool readKey(std::uint64_t number, std::string& key);
   bool enter(const Object& object, const Path* path, int depth);
   bool readArray(Object& object, const Path* path, int depth, Value& value);
   bool readDictionary(Object& object, const Path* path, int depth, Value& value);
-  bool isNull(std::uint64_t number, bool& null);
 
   std::uint64_t reference(std::string_view references, std::uint64_t i) const {
     return bigEndian(references.data() + i * _referenceSize, _referenceSize);
@@ -170,15 +184,10 @@ bool Reader::chargeText(std::uint64_t bytes) {
   return true;
 }
 
-bool Reader::locate(std::uint64_t number, Object& object) {
-  if (number >= _count) {
-    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
-  }
+inline bool Reader::locate(std::uint64_t number, Object& object) {
+  if (number >= _count) return badReference(number);
   const std::uint64_t offset = bigEndian(_bytes.data() + _table + number * _offsetSize, _offsetSize);
-  if (offset < kHeader.size() || offset >= _table) {
-    return fail(Kind::malformed,
-                fmt::format("object {}: offset {} lies outside the objects", number, offset));
-  }
+  if (offset < kHeader.size() || offset >= _table) return badOffset(number, offset);
   object.number = number;
   object.marker = static_cast<std::uint8_t>(_bytes[offset]);
   object.rest = std::string_view(_bytes.data() + offset + 1, _table - offset - 1);
@@ -186,7 +195,7 @@ bool Reader::locate(std::uint64_t number, Object& object) {
 }
 
 // The count of a marker: its low half, or an integer object right behind it when that is 15.
-bool Reader::takeCount(Object& object, std::uint64_t& count) {
+inline bool Reader::takeCount(Object& object, std::uint64_t& count) {
   count = object.marker & 0xFu;
   if (count != 0xF) return true;
   const std::uint8_t marker = object.rest.empty() ? 0 : static_cast<std::uint8_t>(object.rest[0]);
@@ -199,15 +208,13 @@ bool Reader::takeCount(Object& object, std::uint64_t& count) {
   return true;
 }
 
-bool Reader::take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes) {
+inline bool Reader::take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes) {
   if (count > object.rest.size() / width) return malformed(object, "it reaches beyond the objects");
   bytes = object.rest.substr(0, count * width);
   return true;
 }
 
-bool Reader::readObject(std::uint64_t number, const Path* path, int depth, Value& value) {
-  Object object{};
-  if (!locate(number, object)) return false;
+bool Reader::readObject(Object& object, const Path* path, int depth, Value& value) {
   switch (object.marker & 0xF0) {
     case kSimple:
       return readSimple(object, value);
@@ -325,14 +332,6 @@ bool Reader::readText(Object& object, std::string& text) {
   return true;
 }
 
-bool Reader::readKey(std::uint64_t number, std::string& key) {
-  Object object{};
-  if (!locate(number, object)) return false;
-  const std::uint8_t type = object.marker & 0xF0;
-  if (type != kASCII && type != kUTF16) return malformed(object, "a key that is no text");
-  return readText(object, key);
-}
-
 bool Reader::enter(const Object& object, const Path* path, int depth) {
   for (; path; path = path->outer) {
     if (path->object == object.number) {
@@ -355,7 +354,11 @@ bool Reader::readArray(Object& object, const Path* path, int depth, Value& value
   Array array;
   array.reserve(count);
   for (std::uint64_t i = 0; i < count; ++i) {
-    if (!readObject(reference(references, i), &here, depth + 1, array.emplace_back(false))) return false;
+    Object element;
+    if (!locate(reference(references, i), element) ||
+        !readObject(element, &here, depth + 1, array.emplace_back(false))) {
+      return false;
+    }
   }
   value = Value(std::move(array));
   return true;
@@ -372,25 +375,20 @@ bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& 
   std::vector<Dictionary::Entry> entries;
   entries.reserve(count);
   for (std::uint64_t i = 0; i < count; ++i) {
+    Object key;
+    Object held;
+    if (!locate(reference(references, i), key) || !locate(reference(references, count + i), held))
+      return false;
+    if (!isText(key)) return malformed(key, "a key that is no text");
     auto& entry = entries.emplace_back(std::string(), false);
-    if (!readKey(reference(references, i), entry.first)) return false;
-    const std::uint64_t number = reference(references, count + i);
-    bool null = false;
-    if (!isNull(number, null)) return false;
-    if (null) {
+    if (!readText(key, entry.first)) return false;
+    if (held.marker == kNull) {
       entries.pop_back();
-    } else if (!readObject(number, &here, depth + 1, entry.second)) {
+    } else if (!readObject(held, &here, depth + 1, entry.second)) {
       return false;
     }
   }
   value = Value(Dictionary::fromEntries(std::move(entries)));
-  return true;
-}
-
-bool Reader::isNull(std::uint64_t number, bool& null) {
-  Object object{};
-  if (!locate(number, object)) return false;
-  null = object.marker == kNull;
   return true;
 }
 

@@ -85,10 +85,10 @@ void Measure::add(const Value& value) {
       bytes += 1;
       break;
     case Value::Type::signedInteger:
-      bytes += integerSize(static_cast<std::uint64_t>(*value.toInt64()), true);
+      bytes += integerSize(static_cast<std::uint64_t>(*value.asSigned()), true);
       break;
     case Value::Type::unsignedInteger:
-      bytes += integerSize(static_cast<std::uint64_t>(*value.toInt64()), false);
+      bytes += integerSize(*value.asUnsigned(), false);
       break;
     case Value::Type::real:
     case Value::Type::date:
@@ -119,6 +119,10 @@ void Measure::add(const Value& value) {
 }
 
 void putBigEndian(char*& at, std::uint64_t number, std::size_t size) {
+  if (size == 1) {  // nearly every reference
+    *at++ = static_cast<char>(number);
+    return;
+  }
   for (std::size_t i = size; i > 0; --i) {
     at[i - 1] = static_cast<char>(number);
     number >>= 8;
@@ -201,9 +205,9 @@ void Writer::put(const Value& value) {
     case Value::Type::boolean:
       return putByte(*value.toBoolean() ? kTrue : kFalse);
     case Value::Type::signedInteger:
-      return putIntegerObject(static_cast<std::uint64_t>(*value.toInt64()));
+      return putIntegerObject(static_cast<std::uint64_t>(*value.asSigned()));
     case Value::Type::unsignedInteger:
-      return putUnsigned(static_cast<std::uint64_t>(*value.toInt64()));
+      return putUnsigned(*value.asUnsigned());
     case Value::Type::real:
       return putDouble(kReal | 3, *value.asReal());
     case Value::Type::date:

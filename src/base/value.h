@@ -1,5 +1,5 @@
-// Value: what a property list holds, the one value type of the system. Immutable and shared: copies are cheap, a
-// change makes a new value. Any thread.
+// Value: what a property list holds, the one value type of the system. Immutable and shared: copies are
+// cheap, a change makes a new value. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -54,6 +54,8 @@ class Value {
 
   // Exactly this type, else null. The pointer lives as long as this value.
   const std::string* asString() const { return std::get_if<std::string>(&_held); }
+  const std::int64_t* asSigned() const { return std::get_if<std::int64_t>(&_held); }
+  const std::uint64_t* asUnsigned() const { return std::get_if<std::uint64_t>(&_held); }
   const double* asReal() const { return std::get_if<double>(&_held); }
   const Date* asDate() const { return std::get_if<Date>(&_held); }
   const Data* asData() const;
@@ -64,9 +66,9 @@ class Value {
   // An integer of either sign, or a real; a boolean is not a number here.
   bool isNumber() const;
 
-  // The rule for numbers and booleans in dictionaries from clients and storebags: a boolean read as a number is 1
-  // or 0, a number read as a boolean is true unless 0; integers wrap to the width asked for; reals truncate; NaN,
-  // infinity and reals beyond 64 bits are absent; a text is never a number.
+  // The rule for numbers and booleans in dictionaries from clients and storebags: a boolean read as a number
+  // is 1 or 0, a number read as a boolean is true unless 0; integers wrap to the width asked for; reals
+  // truncate; NaN, infinity and reals beyond 64 bits are absent; a text is never a number.
   std::optional<bool> toBoolean() const;
   std::optional<std::int64_t> toInt64() const;
   std::optional<std::int32_t> toInt32() const;
@@ -77,7 +79,8 @@ class Value {
   // A string as it is; a number or boolean as its decimal text (booleans "1" and "0"); anything else absent.
   std::optional<std::string> toText() const;
 
-  // Exact: 1, 1u and 1.0 differ in type but integers of equal value are equal. Arrays and dictionaries by content.
+  // Exact: 1, 1u and 1.0 differ in type but integers of equal value are equal. Arrays and dictionaries by
+  // content.
   bool operator==(const Value& other) const;
 
  private:
