@@ -26,8 +26,8 @@
 
 namespace veltrad {
 
-// The place of a lock in the order: a thread takes only locks of a higher rank than the highest it holds. Leaves
-// have the highest rank and take nothing further.
+// The place of a lock in the order: a thread takes only locks of a higher rank than the highest it holds.
+// Leaves have the highest rank and take nothing further.
 enum class LockRank : int {
   sessionList = 10,
   agent = 20,

@@ -33,23 +33,30 @@ bool Value::isNumber() const {
 
 std::optional<bool> Value::toBoolean() const {
   switch (type()) {
-    case Type::boolean: return std::get<bool>(_held);
-    case Type::signedInteger: return std::get<std::int64_t>(_held) != 0;
-    case Type::unsignedInteger: return std::get<std::uint64_t>(_held) != 0;
+    case Type::boolean:
+      return std::get<bool>(_held);
+    case Type::signedInteger:
+      return std::get<std::int64_t>(_held) != 0;
+    case Type::unsignedInteger:
+      return std::get<std::uint64_t>(_held) != 0;
     case Type::real: {
       const double number = std::get<double>(_held);
       if (!std::isfinite(number)) return std::nullopt;
       return number != 0;
     }
-    default: return std::nullopt;
+    default:
+      return std::nullopt;
   }
 }
 
 std::optional<std::int64_t> Value::toInt64() const {
   switch (type()) {
-    case Type::boolean: return std::get<bool>(_held) ? 1 : 0;
-    case Type::signedInteger: return std::get<std::int64_t>(_held);
-    case Type::unsignedInteger: return static_cast<std::int64_t>(std::get<std::uint64_t>(_held));
+    case Type::boolean:
+      return std::get<bool>(_held) ? 1 : 0;
+    case Type::signedInteger:
+      return std::get<std::int64_t>(_held);
+    case Type::unsignedInteger:
+      return static_cast<std::int64_t>(std::get<std::uint64_t>(_held));
     case Type::real: {
       const double number = std::get<double>(_held);
       // 64 bits of either sign: [-2^63, 2^64).
@@ -57,7 +64,8 @@ std::optional<std::int64_t> Value::toInt64() const {
       if (number < 0x1p63) return static_cast<std::int64_t>(number);
       return static_cast<std::int64_t>(static_cast<std::uint64_t>(number));
     }
-    default: return std::nullopt;
+    default:
+      return std::nullopt;
   }
 }
 
@@ -81,42 +89,54 @@ std::optional<std::uint16_t> Value::toUInt16() const {
 
 std::optional<double> Value::toDouble() const {
   switch (type()) {
-    case Type::boolean: return std::get<bool>(_held) ? 1.0 : 0.0;
-    case Type::signedInteger: return static_cast<double>(std::get<std::int64_t>(_held));
-    case Type::unsignedInteger: return static_cast<double>(std::get<std::uint64_t>(_held));
+    case Type::boolean:
+      return std::get<bool>(_held) ? 1.0 : 0.0;
+    case Type::signedInteger:
+      return static_cast<double>(std::get<std::int64_t>(_held));
+    case Type::unsignedInteger:
+      return static_cast<double>(std::get<std::uint64_t>(_held));
     case Type::real: {
       const double number = std::get<double>(_held);
       if (!std::isfinite(number)) return std::nullopt;
       return number;
     }
-    default: return std::nullopt;
+    default:
+      return std::nullopt;
   }
 }
 
 std::optional<std::string> Value::toText() const {
   switch (type()) {
-    case Type::boolean: return std::get<bool>(_held) ? "1" : "0";
-    case Type::signedInteger: return fmt::format("{}", std::get<std::int64_t>(_held));
-    case Type::unsignedInteger: return fmt::format("{}", std::get<std::uint64_t>(_held));
+    case Type::boolean:
+      return std::get<bool>(_held) ? "1" : "0";
+    case Type::signedInteger:
+      return fmt::format("{}", std::get<std::int64_t>(_held));
+    case Type::unsignedInteger:
+      return fmt::format("{}", std::get<std::uint64_t>(_held));
     case Type::real: {
       // fmt marks a whole real with ".0"; a decimal text has no need of it.
       std::string text = fmt::format("{}", std::get<double>(_held));
       if (text.ends_with(".0")) text.resize(text.size() - 2);
       return text;
     }
-    case Type::string: return std::get<std::string>(_held);
-    default: return std::nullopt;
+    case Type::string:
+      return std::get<std::string>(_held);
+    default:
+      return std::nullopt;
   }
 }
 
 bool Value::operator==(const Value& other) const {
   if (type() == other.type()) {
     switch (type()) {
-      case Type::data: return *asData() == *other.asData();
-      case Type::array: return asArray() == other.asArray() || *asArray() == *other.asArray();
+      case Type::data:
+        return *asData() == *other.asData();
+      case Type::array:
+        return asArray() == other.asArray() || *asArray() == *other.asArray();
       case Type::dictionary:
         return asDictionary() == other.asDictionary() || *asDictionary() == *other.asDictionary();
-      default: return _held == other._held;
+      default:
+        return _held == other._held;
     }
   }
   if (type() == Type::signedInteger && other.type() == Type::unsignedInteger) {
@@ -127,7 +147,9 @@ bool Value::operator==(const Value& other) const {
   return false;
 }
 
-Dictionary::Dictionary(std::initializer_list<Entry> entries) { *this = fromEntries(std::vector<Entry>(entries)); }
+Dictionary::Dictionary(std::initializer_list<Entry> entries) {
+  *this = fromEntries(std::vector<Entry>(entries));
+}
 
 Dictionary Dictionary::fromEntries(std::vector<Entry> entries) {
   const auto before = [](const Entry& a, const Entry& b) { return a.first < b.first; };

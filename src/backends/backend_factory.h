@@ -1,0 +1,56 @@
+// Makes backends by name. Any thread; constant after construction.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "backends/backend.h"
+
+namespace veltrad {
+
+class DeviceIdentity;
+class ProcessSettings;
+class Veltra;
+namespace platform {
+class Clock;
+class Counters;
+class HTTPClient;
+class Locale;
+class Preferences;
+}  // namespace platform
+
+// What the kinds of backends use; each takes its own few. Everything outlives the backends.
+struct BackendServices {
+  platform::HTTPClient& http;
+  platform::Clock& clock;
+  platform::Random& random;
+  platform::Locale& locale;
+  platform::Preferences& preferences;
+  platform::Counters& counters;
+  ProcessSettings& settings;
+  DeviceIdentity& device;
+  const Veltra& library;
+};
+
+class BackendFactory {
+ public:
+  virtual ~BackendFactory() = default;
+  // Null: no such backend here, or it cannot work with this profile; one line has said so.
+  virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
+                                                            const std::optional<std::string>& productFamily,
+                                                            std::int32_t clientType) = 0;
+};
+
+class StandardBackendFactory final : public BackendFactory {
+ public:
+  explicit StandardBackendFactory(BackendServices services) : _services(services) {}
+  std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
+                                                    const std::optional<std::string>& productFamily,
+                                                    std::int32_t clientType) override;
+
+ private:
+  const BackendServices _services;
+};
+
+}  // namespace veltrad

@@ -1,0 +1,256 @@
+// The HTTPS post backend: what becomes of a message, and the flush. Its state stands in https_post_state.cpp.
+#include "backends/https/https_post_backend.h"
+
+#include "backends/https/event.h"
+#include "backends/https/json_message.h"
+#include "config/process_settings.h"
+#include "platform/counters.h"
+#include "platform/locale.h"
+#include "platform/log.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+namespace {
+constexpr std::uint16_t kSessionTypeStop = 1;
+
+bool meansRealtime(std::int32_t flag) {
+  return flag == 1 || flag == 3;
+}
+bool meansSamplingOverride(std::int32_t flag) {
+  return flag == 2 || flag == 3;
+}
+}  // namespace
+
+std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* payload,
+                                                         platform::TimeValue timestamp, std::uint16_t method,
+                                                         std::uint16_t respCode, std::uint16_t eventID,
+                                                         std::int32_t flag) {
+  if (state() == kBackendDisabled) {
+    _services.counters.count("event dropped: the back end is disabled");
+    return std::nullopt;
+  }
+  Dictionary stopPayload;
+  if (respCode == kSessionTypeStop) {
+    logDebug(
+        "HTTPSPostBackend(sendMessage): Adding dnu type and sampling threshold to SESSION_TYPE_STOP message "
+        "dictionary");
+    if (payload) {
+      stopPayload = withStopFields(payload);
+      payload = &stopPayload;
+    } else {
+      logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
+    }
+  }
+  Dictionary event = createEventDictfromPayload(*this, payload, timestamp, method, respCode, eventID,
+                                                _services.locale.timeZoneOffset());
+  prepareEventForMessage(event);
+  if (meansSamplingOverride(flag) && state() == kBackendHeld) setState(kBackendReporting);
+  const bool realtime = meansRealtime(flag);
+  logDebug("HTTPSPostBackend(sendMessage): realtime is %d", realtime ? 1 : 0);
+
+  const std::int32_t now = state();
+  const bool userInfoMissing = requireUserInfo() && !userInfoDict();
+  if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batchEvents()) || userInfoMissing) {
+    logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batchEvents(), requireUserInfo());
+    return batchEvent(method, std::move(event));
+  }
+  return postEvent(std::move(event), realtime, method, respCode, flag);
+}
+
+std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, bool realtime, std::uint16_t method,
+                                                       std::uint16_t respCode, std::int32_t flag) {
+  std::optional<std::string> flushed;
+  bool batchExists = false;
+  {
+    const Lock held(_batchMutex);
+    batchExists = _batch.exists();
+  }
+  if (realtime && batchExists) {
+    logDebug(
+        "HTTPSPostBackend(sendMessage): Got a realtime event and some events have already been batched. "
+        "Forcing Flush "
+        "here to keep events in order.");
+    flushed = flushMessagesWithCompletion(nullptr);
+  }
+  logDebug("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents(), requireUserInfo());
+  std::vector<Dictionary> events;
+  events.push_back(std::move(event));
+  std::optional<std::string> pretty;
+  std::string json = createMessageForPostAndLogging(std::move(events), pretty);
+  std::optional<std::string> result = pretty;
+  if (flushed) {
+    result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + (pretty ? *pretty : "(null)");
+  }
+  postJSONMessage(std::move(json), flag, EventMap{method, respCode}, 1, nullptr);
+  return result;
+}
+
+Dictionary HTTPSPostBackend::withStopFields(const Dictionary* payload) const {
+  Dictionary fields{{"Batch", batchEvents() ? 1u : 0u}, {"Opt", _dnuType}};
+  const auto orMinusOne = [](const std::optional<double>& number) {
+    return number ? Value(*number) : Value(-1);
+  };
+  fields.set("OverrideSampling", orMinusOne(_overrideSampling));
+  fields.set("SamplingThreshold", orMinusOne(samplingThreshold()));
+  Dictionary extended = *payload;
+  extended.merge(fields);
+  return extended;
+}
+
+void HTTPSPostBackend::prepareEventForMessage(Dictionary& event) const {
+  if (const SharedDictionary userInfo = userInfoDict()) event.merge(*userInfo);
+}
+
+std::optional<std::string> HTTPSPostBackend::batchEvent(std::uint16_t method, Dictionary event) {
+  std::optional<std::string> flushed;
+  bool reached = false;
+  bool full = false;
+  {
+    const Lock held(_batchMutex);
+    reached = _batch.thresholdReached(method, _eventThreshold);
+    full = _batch.full(event);
+  }
+  if (reached) {
+    logDebug(
+        "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
+        "%d",
+        method);
+    flushed = flushMessagesWithCompletion(nullptr);
+  } else if (full && state() == kBackendReporting) {
+    flushed = flushMessagesWithCompletion(nullptr);
+  }
+  std::size_t dropped = 0;
+  {
+    const Lock held(_batchMutex);
+    if (reached) _batch.restartCount(method);
+    while (_batch.size() > 0 && _batch.full(event)) {
+      _batch.dropOldest();
+      ++dropped;
+    }
+    _batch.add(method, std::move(event));
+  }
+  if (dropped > 0) _services.counters.count("event dropped: the batch is full", dropped);
+  _services.counters.count("event held: batched");
+  return flushed;
+}
+
+std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
+  bool exists = false;
+  std::size_t discarded = 0;
+  {
+    const Lock held(_batchMutex);
+    exists = _batch.exists();
+    if (exists && state() != kBackendReporting) {
+      discarded = _batch.size();
+      _batch.discard();
+      exists = false;
+    }
+  }
+  if (discarded > 0)
+    _services.counters.count("event dropped: flushed while the back end does not report", discarded);
+  if (!exists) {
+    if (completion) completion(std::nullopt, makeReportingError("Nothing to flush", -1));
+    return std::nullopt;
+  }
+  const SharedDictionary userInfo = userInfoDict();
+  if (requireUserInfo() && !userInfo) {
+    if (completion) completion(std::nullopt, makeReportingError("Can not flush: userInfo is required", -1));
+    return std::nullopt;
+  }
+  logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
+  std::vector<Dictionary> events;
+  {
+    const Lock held(_batchMutex);
+    events = _batch.take();
+  }
+  if (userInfo) {
+    for (Dictionary& event : events) event.merge(*userInfo);
+  }
+  const std::size_t count = events.size();
+  std::optional<std::string> pretty;
+  std::string json = createMessageForPostAndLogging(std::move(events), pretty);
+  FlushCompletion whenPosted;
+  if (completion) {
+    whenPosted = [completion = std::move(completion), pretty](const std::optional<std::string>&,
+                                                              std::optional<ReportingError> error) {
+      completion(pretty, std::move(error));
+    };
+  }
+  postJSONMessage(std::move(json), 0, std::nullopt, count, std::move(whenPosted));
+  return pretty;
+}
+
+void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {
+  setCombinedSessionIDString(sessionID);
+  const Lock held(_batchMutex);
+  _batch.setSessionID(sessionID);
+}
+
+std::string HTTPSPostBackend::createMessageForPostAndLogging(std::vector<Dictionary> events,
+                                                             std::optional<std::string>& pretty) {
+  const double postTime = platform::timevalToSeconds(_services.clock.now());
+  std::size_t removed = 0;
+  for (Dictionary& event : events) removed += restrictEventForJSON(event);
+  if (removed > 0) _services.counters.count("event field removed: JSON cannot carry it", removed);
+  JSONMessage message = makeJSONMessage(postTime, clientIdentifier(), std::move(events), loggingAllowed());
+  pretty = std::move(message.pretty);
+  return std::move(message.compact);
+}
+
+const std::string& HTTPSPostBackend::clientIdentifier() const {
+  if (isInternal() && _extrasOnInternal != 0) return udid();
+  if (_uuidCustom) return *_uuidCustom;
+  return _dnuType != 0 ? _uuidOverrideDnu : _uuidRespectDnu;
+}
+
+bool HTTPSPostBackend::loggingAllowed() const {
+  if (_dnuType == 0 && _dnuEnabled) return true;
+  if (!_forceEventLogging) return false;
+  const std::uint32_t environment = _services.settings.currentEnvironment();
+  return environment == 1 || environment == 2;
+}
+
+void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
+                                       std::optional<EventMap> eventMap, std::size_t eventCount,
+                                       FlushCompletion completion) {
+  const auto& url = meansRealtime(withFlag) ? _realtimePostURL : _postURL;
+  if (!url) {
+    _services.counters.count("event lost: postURL is nil", eventCount);
+    if (completion) completion(std::nullopt, makeReportingError("postURL is nil", -1));
+    return;
+  }
+  platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
+  auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
+  _services.http.start(std::move(request), [self, eventCount, completion = std::move(completion)](
+                                               const platform::HTTPResult& result) {
+    self->handleAnswer(result, eventCount, completion);
+  });
+}
+
+void HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result, std::size_t eventCount,
+                                    const FlushCompletion& completion) {
+  std::optional<ReportingError> error;
+  int status = 0;
+  if (result.ok()) {
+    status = result.value().status;
+  } else {
+    logError("HTTPSPostBackend(postJsonMessage): post error: %s", result.error().description.c_str());
+    error = makeReportingError(result.error().description, -1);
+    _services.counters.count("event lost: the post failed", eventCount);
+  }
+  const PostVerdict verdict = verdictOfStatus(status);
+  if (verdict.disablesBackend) {
+    const std::string text =
+        "backend " + name() + " disabled by server " + std::to_string(verdict.status) + " return code";
+    logInfo("postJSONMessage: %s", text.c_str());
+    setState(kBackendDisabled);
+    error = makeReportingError(text, verdict.status);
+    _services.counters.count("event lost: the server answered 5xx", eventCount);
+  } else if (result.ok()) {
+    _services.counters.count("event posted", eventCount);
+  }
+  if (completion) completion(std::nullopt, std::move(error));
+}
+
+}  // namespace veltrad

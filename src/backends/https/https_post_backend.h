@@ -1,0 +1,84 @@
+// HTTPSPostBackend: messages become JSON events, posted at once or in batches. The session's thread sends and
+// flushes; setCorrelatedSessionID may come from another session's thread; answers come on the HTTP thread.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/backend.h"
+#include "backends/backend_factory.h"
+#include "backends/https/event_batch.h"
+#include "backends/https/post_request.h"
+
+namespace veltrad {
+
+class HTTPSPostBackend final : public VeltraBackend {
+ public:
+  // Null without a profile, a product family or the profile's "clients" (one error line).
+  static std::shared_ptr<HTTPSPostBackend> initWithName(const BackendServices& services,
+                                                        const std::string& name, const Dictionary* profile,
+                                                        const std::optional<std::string>& productFamily);
+
+  void updateState() override;
+  using VeltraBackend::sendMessage;
+  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
+                                         std::int32_t flag) override;
+  std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
+  void setCorrelatedSessionID(const std::string& sessionID) override;
+
+  const std::optional<std::string>& postURL() const { return _postURL; }
+
+ private:
+  HTTPSPostBackend(const BackendServices& services, const std::string& name, const Dictionary& profile,
+                   const std::string& productFamily);
+
+  std::int32_t updateBackendState();
+  void applyExpedite(const Array& clients, const std::optional<std::string>& clientName,
+                     const std::optional<std::string>& serviceName);
+  bool updatePostLink(const Dictionary& entry);
+  void resetBackendStateWithClient(const Dictionary* entry);
+
+  Dictionary withStopFields(const Dictionary* payload) const;
+  void prepareEventForMessage(Dictionary& event) const;
+  std::optional<std::string> batchEvent(std::uint16_t method, Dictionary event);
+  std::optional<std::string> postEvent(Dictionary event, bool realtime, std::uint16_t method,
+                                       std::uint16_t respCode, std::int32_t flag);
+  // The compact JSON; `pretty` gets the readable copy where logging is allowed.
+  std::string createMessageForPostAndLogging(std::vector<Dictionary> events,
+                                             std::optional<std::string>& pretty);
+  const std::string& clientIdentifier() const;
+  bool loggingAllowed() const;
+  void postJSONMessage(std::string json, std::int32_t withFlag, std::optional<EventMap> eventMap,
+                       std::size_t eventCount, FlushCompletion completion);
+  void handleAnswer(const platform::HTTPResult& result, std::size_t eventCount,
+                    const FlushCompletion& completion);
+
+  // Constant after construction.
+  const BackendServices _services;
+  const bool _dnuEnabled;
+  const bool _forceEventLogging;
+  const std::string _uuidRespectDnu;
+  const std::string _uuidOverrideDnu;
+
+  // The session's thread only.
+  std::optional<std::string> _postURL;
+  bool _useDefaultPostURL = false;
+  std::optional<std::string> _realtimePostURL;
+  bool _useDefaultRealtimePostURL = false;
+  std::int32_t _dnuType = 0;
+  std::int32_t _eventThreshold = 49;
+  std::int32_t _extrasOnInternal = 0;
+  std::optional<double> _overrideSampling;
+  std::optional<std::string> _uuidCustom;
+
+  Mutex _batchMutex{LockRank::backend};
+  EventBatch _batch GUARDED_BY(_batchMutex);
+};
+
+// "forceEventLogging": true when the text, after blanks, a sign and zeros, begins with Y, y, T, t or a digit
+// 1 to 9.
+bool textMeansYes(const std::optional<std::string>& text);
+
+}  // namespace veltrad

@@ -1,0 +1,75 @@
+// Envelope making.
+#include "backends/https/json_message.h"
+
+#include <cmath>
+
+#include "base/json.h"
+#include "platform/log.h"
+
+namespace veltrad {
+
+namespace {
+enum class Fate { keep, toSeconds, remove };
+
+Fate fateOf(const Value& value) {
+  switch (value.type()) {
+    case Value::Type::boolean:
+    case Value::Type::signedInteger:
+    case Value::Type::unsignedInteger:
+    case Value::Type::string:
+      return Fate::keep;
+    case Value::Type::real:
+      return value.toDouble() ? Fate::keep : Fate::remove;  // absent: not finite
+    case Value::Type::date:
+      return Fate::toSeconds;
+    case Value::Type::data:
+    case Value::Type::array:
+    case Value::Type::dictionary:
+      return Fate::remove;
+  }
+  return Fate::remove;
+}
+
+double finiteOrMinusOne(double seconds) {
+  return std::isfinite(seconds) ? seconds : -1.0;
+}
+}  // namespace
+
+std::size_t restrictEventForJSON(Dictionary& event) {
+  std::vector<Dictionary::Entry> changed;
+  for (const auto& [key, value] : event) {
+    const Fate fate = fateOf(value);
+    if (fate == Fate::keep) continue;
+    if (fate == Fate::remove) {
+      logWarning(
+          "HTTPSPostBackend(createMessageForPostAndLogging): Quillfen unable to handle key: %s, value: %s",
+          key.c_str(), writeJSON(value).substr(0, 256).c_str());
+    }
+    changed.emplace_back(key, value);
+  }
+  // Applied after the walk, which they must not disturb.
+  std::size_t removed = 0;
+  for (auto& [key, value] : changed) {
+    if (const Date* date = value.asDate()) {
+      event.set(key, finiteOrMinusOne(date->secondsSince1970));
+    } else {
+      event.erase(key);
+      ++removed;
+    }
+  }
+  return removed;
+}
+
+JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
+                            bool wantPretty) {
+  Array list;
+  list.reserve(events.size());
+  for (Dictionary& event : events) list.emplace_back(std::move(event));
+  const Value envelope = Dictionary{
+      {"clientId", clientID}, {"events", std::move(list)}, {"postTime", finiteOrMinusOne(postTime)}};
+  JSONMessage message{writeJSON(envelope), std::nullopt};
+  if (wantPretty) message.pretty = writeJSON(envelope, JSONStyle::pretty);
+  return message;
+}
+
+}  // namespace veltrad

@@ -1,0 +1,59 @@
+// Headers and body of a post.
+#include "backends/https/post_request.h"
+
+#include <fmt/format.h>
+
+#include "backends/backend.h"
+#include "backends/https/event.h"
+#include "protocol/constants.h"
+#include "support/gzip.h"
+
+namespace veltrad {
+
+namespace {
+std::string orNull(const std::optional<std::string>& text) {
+  return text ? *text : "(null)";
+}
+}  // namespace
+
+platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
+                                      std::optional<EventMap> eventMap) {
+  platform::HTTPRequest request;
+  request.method = platform::HTTPRequest::Method::post;
+  request.lane = platform::HTTPRequest::Lane::event;
+  request.url = std::move(url);
+
+  auto compressed = gzipDeflate(json);
+  const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
+  request.body = useCompressed ? std::move(*compressed) : std::move(json);
+
+  auto& headers = request.headers;
+  if (const SharedDictionary userInfo = backend.userInfoDict()) {
+    if (const std::string* name = userInfo->string(kVeltraUserInfoClientName)) {
+      headers.emplace_back("X-VLT-Client-Name", *name);
+    }
+    if (const std::string* name = userInfo->string(kVeltraUserInfoServiceName)) {
+      headers.emplace_back("X-VLT-Service-Name", *name);
+    }
+  }
+  if (backend.isInternal()) headers.emplace_back("X-VLT-Internal-Build", "1");
+  headers.emplace_back("User-Agent", fmt::format("Veltra/{}.{} ({}; {})", backend.selfVersionMajor(),
+                                                 backend.selfVersionMinor(), orNull(backend.hardwareType()),
+                                                 orNull(backend.productVersion())));
+  headers.emplace_back("X-VLT-Client-Version", fmt::format("{}", backend.clientVersion()));
+  headers.emplace_back("X-VLT-Sender", senderCode(backend.compType()));
+  if (eventMap) {
+    headers.emplace_back("X-VLT-Event-Map", fmt::format("{} {}", eventMap->method, eventMap->responseCode));
+  }
+  headers.emplace_back("Accept", "application/json");
+  headers.emplace_back("Content-Type", "application/json");
+  headers.emplace_back("Content-Length", fmt::format("{}", request.body.size()));
+  if (useCompressed) headers.emplace_back("Content-Encoding", "gzip");
+  return request;
+}
+
+PostVerdict verdictOfStatus(int status) {
+  return {status >= 500 && status <= 599, status};
+}
+
+}  // namespace veltrad

@@ -1,0 +1,30 @@
+// How names are held against lists of texts: letter case ignored. Plain functions; any thread.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "base/value.h"
+
+namespace veltrad {
+
+// Absent or empty list: `whitelist`. Absent text with a list: the opposite. Else whether an item equals the
+// text.
+bool matchExactStringWithList(const std::vector<std::string>& list,
+                              const std::optional<std::string>& wholeString, bool whitelist);
+// The same, but whether an item occurs inside the text.
+bool matchStringWithList(const std::vector<std::string>& list, const std::optional<std::string>& wholeString,
+                         bool whitelist);
+
+// The items between commas, untrimmed; a null text has none.
+std::vector<std::string> itemsBetweenCommas(const std::string* text);
+// The texts of an array; items of other types are left out.
+std::vector<std::string> textsOf(const Array* array);
+
+// An entry's "client" (exact) and "service" (substring); an entry without both matches every client.
+bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<std::string>& clientName,
+                                 const std::optional<std::string>& serviceID);
+
+}  // namespace veltrad

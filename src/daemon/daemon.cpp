@@ -1,0 +1,18 @@
+// Which room gets which services.
+#include "daemon/daemon.h"
+
+namespace veltrad {
+
+Daemon::Daemon(platform::Services& services)
+    : _library(services.files, services.preferences, services.root),
+      _device(services.device),
+      _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
+      _messageLog(services.clock, services.root.messageLogDirectory()),
+      _factory({services.http, services.clock, services.random, services.locale, services.preferences,
+                services.counters, _settings, _device, _library}),
+      _storebags(services.http, _settings, _library),
+      _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
+              services.counters, _flushes, _messageLog},
+             _storebags, services.transaction) {}
+
+}  // namespace veltrad

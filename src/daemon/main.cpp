@@ -1,0 +1,117 @@
+// veltrad: prepare the process, serve until a signal, stop in order. The main thread runs the loop only.
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdio>
+
+#include "daemon/daemon.h"
+#include "ipc/listener.h"
+#include "ipc/service_socket.h"
+#include "platform/log.h"
+#include "platform/run_loop.h"
+#include "platform/sandbox.h"
+#include "platform/scheduling.h"
+
+namespace {
+
+using namespace veltrad;
+using namespace std::chrono_literals;
+
+constexpr auto kStopBound = 10s;  // from the signal to the end of the process
+constexpr auto kTick = 1000ms;    // counters are written and the watchdog is fed this often
+
+// What is written to later must be there before the sandbox closes.
+bool makeDirectories(const platform::Root& root) {
+  const std::string messageLog = root.messageLogDirectory();
+  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory(), root.logsDirectory(),
+                                       messageLog.substr(0, messageLog.rfind('/'))}) {
+    if (const auto failure = platform::makeDirectories(directory)) {
+      logError("main: cannot make a directory that the daemon writes to: %s", failure->description.c_str());
+      return false;
+    }
+  }
+  return true;
+}
+
+void enterSandbox(const platform::Root& root) {
+  const auto entered = platform::enterSandbox(platform::veltradSandboxProfile(root));
+  if (!entered.ok()) {
+    logError("main: %s\n", entered.error().c_str());
+    _exit(255);
+  }
+  if (entered.value().inForce) {
+    logInfo("main: %s", entered.value().line.c_str());
+  } else {
+    logWarning("main: %s", entered.value().line.c_str());
+  }
+}
+
+std::optional<ipc::ServiceSocket> openSocket(platform::Services& services) {
+  const auto handedOver = services.serviceManager.handedOverSocket();
+  if (!handedOver.ok()) {
+    logError("main: %s", handedOver.error().c_str());
+    return std::nullopt;
+  }
+  auto socket = ipc::openServiceSocket(services.root, handedOver.value());
+  if (!socket.ok()) {
+    logError("main: %s", socket.error().c_str());
+    return std::nullopt;
+  }
+  return std::move(socket).value();
+}
+
+void serve(platform::Services& services, platform::RunLoop& loop) {
+  const double started = platform::timevalToSeconds(services.clock.now());
+  const auto watchdog = services.serviceManager.watchdogInterval();
+  const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
+  loop.run(tick, [&] {
+    services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
+    if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
+  });
+}
+
+// The listener first, so that every session sends its stop message; then what is still to be posted.
+std::size_t stop(platform::Services& services, Listener& listener) {
+  const auto deadline = std::chrono::steady_clock::now() + kStopBound;
+  services.serviceManager.stopping();
+  services.http.failBlockingWaits();
+  const std::size_t stuck = listener.invalidate(deadline - 1s);
+  services.http.drain(deadline - 500ms);
+  return stuck;
+}
+
+}  // namespace
+
+int main() {
+  platform::takeUtilitySchedulingClass();
+  platform::VeltraLogging::startLogging("veltrad", "Daemon");
+  platform::raiseDescriptorLimit();
+  platform::RunLoop loop;
+  loop.blockSignals();
+
+  platform::Services services(platform::Root::fromEnvironment());
+  const double started = platform::timevalToSeconds(services.clock.now());
+  if (!makeDirectories(services.root)) return 1;
+  enterSandbox(services.root);
+  auto socket = openSocket(services);
+  if (!socket) return 1;
+
+  Daemon daemon(services);
+  Listener listener(
+      {std::move(*socket), services.entitlements, services.counters, services.root.entitlementsPath()},
+      daemon.agent());
+  if (!listener.resume()) return 1;
+  services.serviceManager.ready();
+  logInfo("main: Listener resumes with sandbox, start loop.");
+  serve(services, loop);
+
+  const std::size_t stuck = stop(services, listener);
+  services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
+  if (stuck > 0) {
+    logWarning("main: %zu calls did not end within the time of a stop", stuck);
+    platform::VeltraLogging::stopLogging();
+    _exit(0);
+  }
+  platform::VeltraLogging::stopLogging();
+  return 0;
+}

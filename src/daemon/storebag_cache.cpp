@@ -1,0 +1,92 @@
+// When to download, and what a download leaves in the cache.
+#include "daemon/storebag_cache.h"
+
+#include <cmath>
+
+#include "config/client_types.h"
+#include "config/storebag_source.h"
+#include "platform/clock.h"
+#include "platform/log.h"
+
+namespace veltrad {
+
+CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
+  if (!record.attempted) return CacheVerdict::fetch;
+  const double age = std::abs(now - record.fetchTime);
+  if (record.fetchSuccessful) return age < record.maxAge ? CacheVerdict::serve : CacheVerdict::fetch;
+  return age < kSecondsBetweenAttempts ? CacheVerdict::wait : CacheVerdict::fetch;
+}
+
+std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType,
+                                                                       RecursiveMutex& lock) {
+  const char* name = storebagNameForClientType(clientType);
+  if (!name) {
+    fetchAndCacheStorebag(clientType, nullptr, lock);
+    return nullptr;
+  }
+  for (;;) {
+    const auto at = _cachedStorebags.find(name);
+    if (at == _cachedStorebags.end()) break;
+    if (at->second.beingFetched) {
+      _fetched.wait(lock);
+      continue;
+    }
+    const CacheVerdict verdict = verdictOfRecord(at->second, platform::timevalToSeconds(_clock.now()));
+    if (verdict == CacheVerdict::serve) {
+      logDebug("storebagForSession: Cached storebag found for client type %d", clientType);
+      return at->second.data;
+    }
+    if (verdict == CacheVerdict::wait) {
+      logInfo(
+          "storebagForSession: Not fetching storebag for client type %d - must wait %d seconds between "
+          "attempts",
+          clientType, kSecondsBetweenAttempts);
+      return at->second.data;
+    }
+    break;
+  }
+  fetchAndCacheStorebag(clientType, name, lock);
+  return _cachedStorebags[name].data;
+}
+
+std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {
+  const char* name = storebagNameForClientType(clientType);
+  const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
+  return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
+}
+
+void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType, const char* name, RecursiveMutex& lock) {
+  logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
+  std::int32_t maxAge = 0;
+  std::optional<std::string> version;
+  bool notModified = false;
+  if (!name) {
+    std::optional<std::string> lastModified;
+    _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified, &lastModified);
+    return;
+  }
+  std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
+  _cachedStorebags[name].beingFetched = true;
+  lock.unlock();
+  auto section = _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified,
+                                                                  &lastModified);
+  lock.lock();
+
+  StorebagRecord& record = _cachedStorebags[name];
+  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
+  record.fetchSuccessful = section.has_value() || notModified;
+  if (section) {
+    record.data = std::make_shared<const Dictionary>(std::move(*section));
+    record.version = std::move(version);
+  } else if (!notModified) {
+    logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
+  }
+  record.fetchTime = platform::timevalToSeconds(_clock.now());
+  record.maxAge = maxAge;
+  if (lastModified) record.lastModified = std::move(lastModified);
+  record.attempted = true;
+  record.beingFetched = false;
+  _fetched.notifyAll();
+}
+
+}  // namespace veltrad

@@ -1,0 +1,112 @@
+// Acceptance and invalidation of connections; the sessions' registry.
+#include "daemon/veltrad_agent.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "daemon/user_info_key.h"
+#include "platform/counters.h"
+#include "platform/log.h"
+#include "platform/transaction.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+VeltradAgent::VeltradAgent(const SessionServices& services, StorebagSource& source,
+                           platform::Transaction& transaction)
+    : _services(services), _transaction(transaction), _cachedStorebags(source, services.clock) {}
+
+std::string VeltradAgent::description() const {
+  return fmt::format("<VeltradAgent: {}>", fmt::ptr(this));
+}
+
+bool VeltradAgent::listener(Listener&, const std::shared_ptr<Connection>& connection) {
+  const auto entitlement = connection->valueForEntitlement(kVeltraEntitlement);
+  // Only a boolean true passes; the number 1 does not.
+  if (!entitlement || !entitlement->isBoolean() || !entitlement->toBoolean().value_or(false)) {
+    logDebug(
+        "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
+        connection->description().c_str());
+    _services.counters.count("connection refused: no entitlement");
+    return false;
+  }
+  logDebug("listener: Accepting new Vopex connection %s as it has proper entitlement, %d(%d) connections.",
+           connection->description().c_str(), static_cast<int>(sessionCount()),
+           static_cast<int>(userInfoKeyCount()));
+  const auto session = VeltradSession::initWithSessionDelegate(_services, *this, connection);
+  connection->setExportedObject(session);
+  addSession(session);
+  const std::string name = session->description();
+  connection->setInterruptionHandler(
+      [name] { logDebug("listener: Vopex connection to %s was interrupted", name.c_str()); });
+  connection->setInvalidationHandler([this, session] { sessionInvalidated(session); });
+  connection->resume();
+  return true;
+}
+
+void VeltradAgent::addSession(std::shared_ptr<VeltradSession> session) {
+  const Lock held(_sessionListLock);
+  if (_sessionList.empty()) _transaction.open();
+  _sessionList.push_back(std::move(session));
+  _sessionCount.store(_sessionList.size(), std::memory_order_relaxed);
+}
+
+void VeltradAgent::sessionInvalidated(const std::shared_ptr<VeltradSession>& session) {
+  logDebug("listener: Vopex connection to %s was invalidated", session->description().c_str());
+  {
+    const Lock held(_sessionListLock);
+    std::erase(_sessionList, session);
+    _sessionCount.store(_sessionList.size(), std::memory_order_relaxed);
+    if (_sessionList.empty()) _transaction.close();
+  }
+  const Lock held(_lock);
+  leaveCorrelatedList(session);
+}
+
+// By the remembered key: the session's user info may have been taken away since it joined.
+void VeltradAgent::leaveCorrelatedList(const std::shared_ptr<VeltradSession>& session) {
+  const auto key = _keyOfSession.find(session.get());
+  if (key == _keyOfSession.end()) return;
+  std::erase(_correlatedSessions[key->second], session);
+  _keyOfSession.erase(key);
+}
+
+std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const VeltradSession& session) {
+  const std::int32_t clientType = session.clientType().value_or(0);
+  logDebug("storebagForSession: Retrieving storebag for session %u with client type %d", session.sessionID(),
+           clientType);
+  const Lock held(_lock);
+  return _cachedStorebags.storebagForClientType(clientType, _lock);
+}
+
+std::optional<std::string> VeltradAgent::storebagVersionForSession(const VeltradSession& session) {
+  const Lock held(_lock);
+  return _cachedStorebags.versionForClientType(session.clientType().value_or(0));
+}
+
+void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) {
+  const SharedDictionary userInfo = session->userInfo();
+  if (!userInfo) {
+    logInfo("userInfoUpdatedForSession: No user info found for session %u", session->sessionID());
+    return;
+  }
+  const std::string key = userInfoKeyForUserInfo(userInfo.get());
+  const Lock held(_lock);
+  leaveCorrelatedList(session);
+  logDebug("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s", session->sessionID(),
+           key.c_str());
+  _correlatedSessions[key].push_back(session);
+  _keyOfSession[session.get()] = key;
+  _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
+}
+
+// Every session is a root as long as no back end takes a hierarchy number from its client entry: there is
+// nobody below to refresh.
+void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) {
+  if (!session->userInfo()) {
+    logInfo("updateDownstreamSessions: No user info found for session %u", session->sessionID());
+  }
+}
+
+}  // namespace veltrad

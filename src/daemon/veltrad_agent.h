@@ -1,0 +1,65 @@
+// VeltradAgent: accepts connections and knows every session. Connections' threads call it; it locks for
+// itself.
+#pragma once
+
+#include <atomic>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "base/mutex.h"
+#include "daemon/storebag_cache.h"
+#include "protocol/connection.h"
+#include "session/session_delegate.h"
+#include "session/veltrad_session.h"
+
+namespace veltrad {
+
+namespace platform {
+class Transaction;
+}
+
+// One for the life of the process. It outlives the listener and every session; what the constructor takes
+// outlives it.
+class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegate {
+ public:
+  VeltradAgent(const SessionServices& services, StorebagSource& source, platform::Transaction& transaction);
+
+  bool listener(Listener& listener, const std::shared_ptr<Connection>& shouldAcceptNewConnection) override;
+
+  std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession& session) override;
+  std::optional<std::string> storebagVersionForSession(const VeltradSession& session) override;
+  void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) override;
+  void updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) override;
+  std::string description() const override;
+
+  // Without a lock, for log lines and the service manager's status.
+  std::size_t sessionCount() const { return _sessionCount.load(std::memory_order_relaxed); }
+  std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
+
+ private:
+  void addSession(std::shared_ptr<VeltradSession> session);
+  void sessionInvalidated(const std::shared_ptr<VeltradSession>& session);
+  void leaveCorrelatedList(const std::shared_ptr<VeltradSession>& session) REQUIRES(_lock);
+
+  // Constant after construction.
+  const SessionServices _services;
+  platform::Transaction& _transaction;
+
+  // Also covers opening and closing the transaction.
+  RecursiveMutex _sessionListLock{LockRank::sessionList};
+  std::vector<std::shared_ptr<VeltradSession>> _sessionList GUARDED_BY(_sessionListLock);
+
+  RecursiveMutex _lock{LockRank::agent};
+  StorebagCache _cachedStorebags GUARDED_BY(_lock);
+  // Lists stay when they become empty. A session is in at most one: that of the key it is remembered under.
+  std::map<std::string, std::vector<std::shared_ptr<VeltradSession>>> _correlatedSessions GUARDED_BY(_lock);
+  std::map<const VeltradSession*, std::string> _keyOfSession GUARDED_BY(_lock);
+
+  // Kept beside the collections.
+  std::atomic<std::size_t> _sessionCount{0};
+  std::atomic<std::size_t> _userInfoKeyCount{0};
+};
+
+}  // namespace veltrad

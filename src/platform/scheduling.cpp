@@ -1,0 +1,34 @@
+// Scheduling class and limits, by system call. A refusal changes nothing that a user would notice, so none is
+// reported.
+#include "platform/scheduling.h"
+
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace veltrad::platform {
+
+namespace {
+constexpr int kUtilityNice = 5;
+constexpr int kIOPriorityWhoProcess = 1;
+constexpr int kIOPriorityBestEffort = 2 << 13;  // the class in the upper bits, the level 0 to 7 in the lower
+constexpr int kUtilityIOLevel = 6;
+}  // namespace
+
+void takeUtilitySchedulingClass() {
+  errno = 0;
+  const int now = getpriority(PRIO_PROCESS, 0);
+  if (errno == 0 && now < kUtilityNice) setpriority(PRIO_PROCESS, 0, kUtilityNice);
+  syscall(SYS_ioprio_set, kIOPriorityWhoProcess, 0, kIOPriorityBestEffort | kUtilityIOLevel);
+}
+
+void raiseDescriptorLimit() {
+  struct rlimit limit {};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur == limit.rlim_max) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+}  // namespace veltrad::platform

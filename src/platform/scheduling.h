@@ -1,0 +1,13 @@
+// Scheduling class and limits of the process. Main thread, before any other thread exists: later threads
+// inherit.
+#pragma once
+
+namespace veltrad::platform {
+
+// Work that somebody awaits, but not at once: nice 5 at least, I/O in the lower half of the best-effort
+// class.
+void takeUtilitySchedulingClass();
+// The soft limit on descriptors up to the hard one.
+void raiseDescriptorLimit();
+
+}  // namespace veltrad::platform

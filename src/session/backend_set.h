@@ -1,0 +1,41 @@
+// The backends of one session, made from a storebag section. Plain functions; the session's thread.
+#pragma once
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "backends/backend.h"
+#include "base/value.h"
+
+namespace veltrad {
+
+class BackendFactory;
+class DeviceIdentity;
+class Veltra;
+namespace platform {
+class Clock;
+}
+
+// By name; the order of the names' bytes is the order in which backends are asked.
+using BackendSet = std::map<std::string, std::shared_ptr<VeltraBackend>, std::less<>>;
+
+struct BackendMaking {
+  BackendFactory& factory;
+  DeviceIdentity& device;
+  const Veltra& library;
+  platform::Clock& clock;
+};
+
+// One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,
+// with one error line, without a storebag or without session info. `deviceID` may be empty.
+std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
+                                                 const Dictionary* sessionInfo,
+                                                 const SharedDictionary& userInfo,
+                                                 const std::string& deviceID);
+
+// The names of those in state 2 or 3.
+std::vector<std::string> reportingNames(const BackendSet& backends);
+
+}  // namespace veltrad

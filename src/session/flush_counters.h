@@ -1,0 +1,33 @@
+// Flushes that wait for their backends. Any thread.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "base/mutex.h"
+#include "protocol/client_session_interface.h"
+#include "protocol/error.h"
+
+namespace veltrad {
+
+// One flush: how many backends are still to answer, and the completion while it is held.
+struct PendingFlush {
+  std::size_t pending = 0;
+  FlushReply completion;  // empty once called, or when nobody waits
+};
+
+// One lock for the flushes of all sessions; the daemon has one object.
+class FlushCounters {
+ public:
+  std::shared_ptr<PendingFlush> begin(std::size_t backends, FlushReply completion);
+  // One backend has answered. The completion is called once: at the first error, or with the last answer;
+  // outside the lock.
+  void finished(PendingFlush& flush, const std::optional<std::string>& answer,
+                const std::optional<ReportingError>& error);
+
+ private:
+  Mutex _mutex{LockRank::flushCounters};
+};
+
+}  // namespace veltrad

@@ -1,0 +1,185 @@
+// A session's messages: routing to the aggregating client and the backends, flushes, uploads.
+#include "backends/backend.h"
+#include "platform/counters.h"
+#include "platform/log.h"
+#include "protocol/connection.h"
+#include "protocol/constants.h"
+#include "session/flush_counters.h"
+#include "session/veltrad_session.h"
+#include "support/message_log.h"
+
+namespace veltrad {
+
+void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                             OptionalDictionary payload, StringReply reply) {
+  logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
+  const auto answer = sendMessageWithCategory(category, type, std::move(payload));
+  if (reply) reply(answer);
+}
+
+void VeltradSession::sendMessageWithDictionary(Dictionary message, StringReply reply) {
+  logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
+  const auto answer = sendMessageWithDictionary(message);
+  if (reply) reply(answer);
+}
+
+void VeltradSession::finishSessionWithReply(StringReply reply) {
+  logDebug("finishSessionWithReply: Finishing session %u", sessionID());
+  const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
+  if (reply) reply(answer);
+}
+
+std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                                                   OptionalDictionary payload) {
+  Dictionary message{{kVeltraMessageParametersCategory, unsigned{category}},
+                     {kVeltraMessageParametersFlag, 0u},
+                     {kVeltraMessageParametersType, unsigned{type}}};
+  if (payload) message.set(kVeltraMessageParametersPayload, std::move(*payload));
+  return sendMessageWithDictionary(message);
+}
+
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message) {
+  const auto set = backends();
+  if (!set) {
+    logDebug("sendMessageWithDictionary: No backends available to send message");
+    _services.counters.count("message dropped: the session has no back ends");
+    return std::nullopt;
+  }
+  const auto category = message.uint32(kVeltraMessageParametersCategory);
+  if (!category) {
+    logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
+    _services.counters.count("message dropped: category is missing");
+    return std::nullopt;
+  }
+  const auto type = message.uint32(kVeltraMessageParametersType);
+  if (!type) {
+    logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
+    _services.counters.count("message dropped: type is missing");
+    return std::nullopt;
+  }
+  const auto category16 = static_cast<std::uint16_t>(*category);
+  const auto type16 = static_cast<std::uint16_t>(*type);
+  const Dictionary* payload = message.dictionary(kVeltraMessageParametersPayload);
+  const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
+  const platform::TimeValue time = _services.clock.now();
+  _services.counters.count("message taken in");
+  if (hasAggregator()) {
+    aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
+  }
+  return offerToBackends(*set, payload, time, category16, type16, flag);
+}
+
+std::optional<std::string> VeltradSession::offerToBackends(const BackendSet& set, const Dictionary* payload,
+                                                           platform::TimeValue time, std::uint16_t category,
+                                                           std::uint16_t type, std::int32_t flag) {
+  std::optional<std::string> result;
+  for (const auto& [name, backend] : set) {
+    auto answer = backend->sendMessage(payload, time, category, type, flag);
+    if (!answer) continue;
+    _services.messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", {name, *answer});
+    const bool replaces = backend->name() == kVeltraBackendHTTPPost;
+    const bool standsIn = backend->name() == kVeltraBackendDashboard && !result;
+    if (replaces || standsIn) result = std::move(answer);
+  }
+  return result;
+}
+
+void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
+                                         std::uint16_t respCode) {
+  sendMessageWithCategory(method, respCode, OptionalDictionary(payload));
+  logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
+}
+
+void VeltradSession::aggregateMessage(const SharedDictionary& info, double timestamp, std::uint16_t category,
+                                      std::uint16_t type, const Dictionary* payload) {
+  OptionalDictionary merged;
+  if (payload) {
+    merged = *payload;
+    if (const SharedDictionary mine = userInfo()) merged->merge(*mine);
+  }
+  sendToAggregator(info, timestamp, category, type, std::move(merged));
+}
+
+void VeltradSession::sendToAggregator(const SharedDictionary& info, double timestamp, std::uint16_t category,
+                                      std::uint16_t type, OptionalDictionary payload) {
+  if (!_connection) return;
+  const auto proxy = _connection->remoteObjectProxyWithErrorHandler([](const std::string& description) {
+    logError("sendMessageWithDictionary: Failed to get remote object proxy: %s", description.c_str());
+  });
+  proxy->sendMessageToClient(info ? OptionalDictionary(*info) : std::nullopt, timestamp, category, type,
+                             std::move(payload));
+}
+
+void VeltradSession::shutdownSessionAggregation() {
+  logDebug("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
+  if (hasAggregator()) sendToAggregator(nullptr, 0, 0, 0, std::nullopt);
+  _hasAggregator.store(false, std::memory_order_relaxed);
+}
+
+void VeltradSession::flushMessagesWithCompletion(FlushReply completion) {
+  logDebug("flushMessagesWithCompletion: Flushing messages for session %u", sessionID());
+  internalFlushMessagesWithCompletion(std::move(completion));
+}
+
+void VeltradSession::internalFlushMessagesWithCompletion(FlushReply completion) {
+  const auto set = backends();
+  if (!set) {
+    const char* text = "No backends available to send message";
+    logDebug("internalFlushMessagesWithCompletion: %s", text);
+    if (completion) completion(std::nullopt, makeReportingError(text, -1));
+    return;
+  }
+  if (set->empty()) {
+    if (completion) completion(std::nullopt, std::nullopt);
+    return;
+  }
+  FlushCounters& flushes = _services.flushes;
+  MessageLog& messageLog = _services.messageLog;
+  const auto flush = flushes.begin(set->size(), std::move(completion));
+  for (const auto& [name, backend] : *set) {
+    // Holds neither the session nor the backend: it may run on the HTTP thread, long after both have gone.
+    backend->flushMessagesWithCompletion(
+        [&flushes, &messageLog, flush, key = name, own = backend->name()](
+            const std::optional<std::string>& answer, const std::optional<ReportingError>& error) {
+          logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
+          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", {key, *answer});
+          flushes.finished(*flush, answer, error);
+        });
+  }
+}
+
+void VeltradSession::uploadFileAtPath(std::string path, std::string extensionToken,
+                                      BooleanReply completionHandler) {
+  logDebug("uploadFileAtPath: Uploading file for session %u", sessionID());
+  bool uploaded = false;
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) uploaded |= backend->uploadFileAtPath(path, extensionToken);
+  }
+  if (uploaded) {
+    logDebug("uploadFileWithURL: File upload successful for %s", path.c_str());
+  } else {
+    logError("uploadFileWithURL: File upload failed for %s", path.c_str());
+  }
+  if (completionHandler) completionHandler(uploaded);
+}
+
+void VeltradSession::uploadLogData(Array logData, UploadLogDataReply completionHandler) {
+  bool uploaded = false;
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) uploaded |= backend->uploadLogData(logData);
+  }
+  if (uploaded) {
+    logDebug("uploadLogData: Log data array upload successful");
+  } else {
+    logError("uploadLogData: Log data array upload failed");
+  }
+  if (completionHandler) completionHandler(uploaded, std::nullopt);
+}
+
+// Not served yet: the reply goes unanswered, which the client is told.
+void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t,
+                                                std::uint16_t, OptionalDictionary, StringReply) {
+  _services.counters.count("message dropped: one-shot messages are not served yet");
+}
+
+}  // namespace veltrad

@@ -1,0 +1,30 @@
+// The start message's two forms.
+#include "session/start_message.h"
+
+#include "platform/locale.h"
+#include "platform/preferences.h"
+#include "protocol/veltra.h"
+#include "support/device_identity.h"
+
+namespace veltrad {
+
+Dictionary startMessagePayload(DeviceIdentity& device, const Veltra& library,
+                               platform::Preferences& preferences, platform::Locale& locale) {
+  const auto automatic = preferences.value("com.florn.timed", "TMAutomaticTimeZoneEnabled");
+  Dictionary payload{{"AutomaticTimeSet", automatic ? automatic->toBoolean().value_or(true) : true}};
+  payload.setIfPresent("Locale", locale.countryCode());
+  if (!device.isInternalBuild()) return payload;
+
+  const auto orUnknown = [](const std::optional<std::string>& fact) {
+    return fact ? *fact : std::string("Unknown");
+  };
+  payload.merge({{"Build", orUnknown(device.deviceBuildVersion())},
+                 {"Hardware", orUnknown(device.deviceHardwareModel())},
+                 {"Product", orUnknown(device.deviceName())},
+                 {"ReportVers", library.packageVersion()},
+                 {"SerialNum", orUnknown(device.deviceSerialNumber())},
+                 {"Version", orUnknown(device.deviceProductVersion())}});
+  return payload;
+}
+
+}  // namespace veltrad

@@ -1,0 +1,251 @@
+// A session's life: creation, configuration, start, state queries, the end.
+#include "session/veltrad_session.h"
+
+#include <fmt/format.h>
+
+#include "base/base64.h"
+#include "platform/counters.h"
+#include "platform/log.h"
+#include "platform/uuid.h"
+#include "protocol/connection.h"
+#include "protocol/constants.h"
+#include "session/session_delegate.h"
+#include "session/start_message.h"
+#include "support/device_identity.h"
+
+namespace veltrad {
+
+namespace {
+SharedDictionary shared(OptionalDictionary dictionary) {
+  return dictionary ? std::make_shared<const Dictionary>(std::move(*dictionary)) : nullptr;
+}
+
+// String equality of the names that make an identity; a name missing on the new side counts as a change.
+bool sameName(const Dictionary& current, const Dictionary& updated, const char* key) {
+  const std::string* before = current.string(key);
+  const std::string* now = updated.string(key);
+  return before && now && *before == *now;
+}
+
+std::string newSessionIDString() {
+  const auto uuid = platform::randomUUID();
+  return encodeBase64({reinterpret_cast<const char*>(uuid.data()), uuid.size()});
+}
+}  // namespace
+
+std::shared_ptr<VeltradSession> VeltradSession::initWithSessionDelegate(
+    const SessionServices& services, VeltradSessionDelegate& delegate,
+    std::shared_ptr<Connection> connection) {
+  logDebug("initWithSessionDelegate: VeltradSession initWithSessionDelegate:%s",
+           delegate.description().c_str());
+  std::shared_ptr<VeltradSession> session(
+      new VeltradSession(services, delegate, std::move(connection), newSessionIDString()));
+  logDebug("initWithSessionDelegate: Initialized session with UUID %s", session->_sessionIDString.c_str());
+  return session;
+}
+
+VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
+                               std::shared_ptr<Connection> connection, std::string sessionIDString)
+    : _services(services),
+      _sessionDelegate(delegate),
+      _sessionIDString(std::move(sessionIDString)),
+      _connection(std::move(connection)) {
+  _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
+}
+
+VeltradSession::~VeltradSession() = default;
+
+std::string VeltradSession::description() const {
+  return fmt::format("<VeltradSession: {}>", fmt::ptr(this));
+}
+
+std::optional<std::string> VeltradSession::storebagVersion() const {
+  const Lock held(_mutex);
+  return _storebagVersion;
+}
+
+SharedDictionary VeltradSession::sessionInfo() const {
+  const Lock held(_mutex);
+  return _sessionInfo;
+}
+
+SharedDictionary VeltradSession::userInfo() const {
+  const Lock held(_mutex);
+  return _userInfo;
+}
+
+std::shared_ptr<const BackendSet> VeltradSession::backends() const {
+  const Lock held(_mutex);
+  return _backends;
+}
+
+std::string VeltradSession::deviceID() const {
+  return _deviceid;
+}
+
+std::optional<std::int32_t> VeltradSession::clientType() const {
+  const SharedDictionary info = sessionInfo();
+  return info ? info->int32(kVeltraSessionInfoClientType) : std::nullopt;
+}
+
+void VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+                                    std::optional<Array> frameworksToCheck, bool hasAggregationBlock) {
+  const std::uint32_t number = sessionInfo ? sessionInfo->uint32(kVeltraSessionInfoSessionID).value_or(0) : 0;
+  _sessionID.store(number, std::memory_order_relaxed);
+  logDebug("setSessionInfo: Configuring session %u", number);
+  const bool required =
+      sessionInfo && sessionInfo->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false);
+  if (userInfo && !required) {
+    logWarning("setSessionInfo: Configure session: user info provided without requiring it");
+  }
+  _frameworks = std::move(frameworksToCheck);
+  {
+    const Lock held(_mutex);
+    _sessionInfo = shared(std::move(sessionInfo));
+    _userInfo = shared(std::move(userInfo));
+  }
+  _hasAggregator.store(hasAggregationBlock, std::memory_order_relaxed);
+}
+
+void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandler) {
+  logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
+  const SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  if (!storebag) {
+    _services.counters.count("start without back ends: no storebag");
+    if (completionHandler) completionHandler(std::nullopt);
+    return;
+  }
+  auto version = _sessionDelegate.storebagVersionForSession(*this);
+  {
+    const Lock held(_mutex);
+    _storebagVersion = std::move(version);
+  }
+  createBackendsWithStorebag(*storebag);
+  updateSessionWithDefaultSessionInfo();
+  sendStartMessage();
+  if (completionHandler) completionHandler(fetchReportingStates());
+}
+
+void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
+  logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
+  const SharedDictionary info = sessionInfo();
+  auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock},
+                             &storebag, info.get(), userInfo(), deviceID());
+  if (made) {
+    for (const auto& [name, backend] : *made) backend->setCombinedSessionIDString(_sessionIDString);
+  }
+  {
+    const Lock held(_mutex);
+    _backends.swap(made);
+  }
+  // A second start: what it replaced is let go in order.
+  if (made) {
+    for (const auto& [name, backend] : *made) backend->cleanup();
+  }
+}
+
+void VeltradSession::sendStartMessage() {
+  internalSendMessage(
+      startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
+      0);
+}
+
+void VeltradSession::updateSessionWithDefaultSessionInfo() {
+  const auto self = shared_from_this();
+  _sessionDelegate.userInfoUpdatedForSession(self);
+  updateReportingStates();
+  _sessionDelegate.updateDownstreamSessions(self);
+}
+
+void VeltradSession::updateReportingStates() {
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) backend->updateState();
+  }
+}
+
+void VeltradSession::updateUserInfoForBackends() {
+  const SharedDictionary info = userInfo();
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) backend->setUserInfoDict(info);
+  }
+}
+
+std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
+  const auto set = backends();
+  if (!set) return std::nullopt;
+  return reportingNames(*set);
+}
+
+void VeltradSession::fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) {
+  logDebug("fetchStatesWithUserInfo: Fetching states for session %u", sessionID());
+  receivedUserInfo(shared(std::move(userInfo)));
+  if (completionHandler) completionHandler(fetchReportingStates());
+}
+
+void VeltradSession::receivedUserInfo(SharedDictionary updated) {
+  const SharedDictionary current = userInfo();
+  if (!updated) {
+    if (!current) return;
+    const SharedDictionary info = sessionInfo();
+    if (info && info->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false)) return;
+  }
+  const bool unchanged = current && updated && sameName(*current, *updated, kVeltraUserInfoClientName) &&
+                         sameName(*current, *updated, kVeltraUserInfoServiceName);
+  {
+    const Lock held(_mutex);
+    _userInfo = std::move(updated);
+  }
+  updateUserInfoForBackends();
+  if (unchanged) return;
+  logDebug("receivedUserInfo: Received new user info for session %u", sessionID());
+  updateSessionWithDefaultSessionInfo();
+}
+
+void VeltradSession::fetchDisplayURL(StringReply reply) {
+  logDebug("fetchDisplayURL: Fetching display URL for session %u", sessionID());
+  std::string url = "URL not available";
+  if (const auto set = backends()) {
+    for (const char* name : {kVeltraBackendHTTPPost, kVeltraBackendHTTPPost2, kVeltraBackendDashboard}) {
+      const auto at = set->find(name);
+      const auto display = at == set->end() ? std::nullopt : at->second->displayURL();
+      if (!display) continue;
+      url = *display;
+      break;
+    }
+  }
+  if (reply) reply(url);
+}
+
+std::int32_t VeltradSession::getSessionHierarchy() const {
+  const auto set = backends();
+  if (!set) return 0;
+  for (const char* name : {kVeltraBackendHTTPPost2, kVeltraBackendHTTPPost}) {
+    const auto at = set->find(name);
+    if (at != set->end()) return at->second->hierarchy();
+  }
+  return 0;
+}
+
+void VeltradSession::end() {
+  logDebug("dealloc: VeltradSession dealloc: %u", sessionID());
+  Dictionary payload;
+  payload.setIfPresent("StorebagVersion", storebagVersion());
+  internalSendMessage(payload, 0, 1);
+  flushMessagesWithCompletion(nullptr);
+  shutdownSessionAggregation();
+  std::shared_ptr<const BackendSet> released;
+  {
+    const Lock held(_mutex);
+    released.swap(_backends);
+    _sessionInfo = nullptr;
+    _userInfo = nullptr;
+    _storebagVersion = std::nullopt;
+  }
+  if (released) {
+    for (const auto& [name, backend] : *released) backend->cleanup();
+  }
+  _frameworks = std::nullopt;
+  _connection = nullptr;
+}
+
+}  // namespace veltrad

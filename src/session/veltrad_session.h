@@ -1,0 +1,134 @@
+// VeltradSession: the daemon's side of one client connection. Its connection's thread makes every call; the
+// agent and other sessions read what is guarded.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "backends/backend.h"
+#include "base/mutex.h"
+#include "base/value.h"
+#include "platform/clock.h"
+#include "protocol/client_session_interface.h"
+#include "session/backend_set.h"
+
+namespace veltrad {
+
+class Connection;
+class FlushCounters;
+class MessageLog;
+class VeltradSessionDelegate;
+namespace platform {
+class Counters;
+class Locale;
+class Preferences;
+}  // namespace platform
+
+// What every session uses. Everything outlives the sessions.
+struct SessionServices {
+  BackendFactory& factory;
+  DeviceIdentity& device;
+  const Veltra& library;
+  platform::Clock& clock;
+  platform::Preferences& preferences;
+  platform::Locale& locale;
+  platform::Counters& counters;
+  FlushCounters& flushes;
+  MessageLog& messageLog;
+};
+
+// The delegate outlives it. Nothing else owns it for long but the agent's list and the connection.
+class VeltradSession final : public ClientSessionInterface,
+                             public std::enable_shared_from_this<VeltradSession> {
+ public:
+  static std::shared_ptr<VeltradSession> initWithSessionDelegate(const SessionServices& services,
+                                                                 VeltradSessionDelegate& delegate,
+                                                                 std::shared_ptr<Connection> connection);
+  ~VeltradSession() override;
+
+  void setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+                      std::optional<Array> frameworksToCheck, bool hasAggregationBlock) override;
+  void startConfigWithCompletionHandler(NamesReply completionHandler) override;
+  void fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) override;
+  void fetchDisplayURL(StringReply reply) override;
+  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, OptionalDictionary payload,
+                               StringReply reply) override;
+  void sendMessageWithDictionary(Dictionary message, StringReply reply) override;
+  void flushMessagesWithCompletion(FlushReply completion) override;
+  void finishSessionWithReply(StringReply reply) override;
+  void uploadFileAtPath(std::string path, std::string extensionToken,
+                        BooleanReply completionHandler) override;
+  void uploadLogData(Array logData, UploadLogDataReply completionHandler) override;
+  void sendMessageWithSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+                                  std::uint16_t category, std::uint16_t type, OptionalDictionary payload,
+                                  StringReply reply) override;
+  // Sends the stop message, flushes, cleans the backends up and lets go of everything.
+  void end() override;
+  std::string description() const override;
+
+  // Any thread.
+  std::uint32_t sessionID() const { return _sessionID.load(std::memory_order_relaxed); }
+  const std::string& sessionIDString() const { return _sessionIDString; }
+  std::optional<std::string> storebagVersion() const;
+  SharedDictionary sessionInfo() const;  // null before it was given
+  SharedDictionary userInfo() const;     // null: none
+  bool hasAggregator() const { return _hasAggregator.load(std::memory_order_relaxed); }
+  // The number that the HTTPS post backend takes from its client entry; 0: root.
+  std::int32_t getSessionHierarchy() const;
+  // The client type of the session info, for the choice of a storebag; absent when it names none.
+  std::optional<std::int32_t> clientType() const;
+
+ private:
+  VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
+                 std::shared_ptr<Connection> connection, std::string sessionIDString);
+
+  void sendStartMessage();
+  void createBackendsWithStorebag(const Dictionary& storebag);
+  void updateUserInfoForBackends();
+  void updateReportingStates();
+  std::optional<std::vector<std::string>> fetchReportingStates() const;
+  void updateSessionWithDefaultSessionInfo();
+  void receivedUserInfo(SharedDictionary userInfo);
+  // Through the checks to the aggregating client and every backend; the answer for the client, or none.
+  std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                                     OptionalDictionary payload);
+  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message);
+  void aggregateMessage(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                        std::uint16_t type, const Dictionary* payload);
+  void sendToAggregator(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
+                        std::uint16_t type, OptionalDictionary payload);
+  void shutdownSessionAggregation();
+  std::optional<std::string> offerToBackends(const BackendSet& backends, const Dictionary* payload,
+                                             platform::TimeValue time, std::uint16_t category,
+                                             std::uint16_t type, std::int32_t flag);
+  void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
+  void internalFlushMessagesWithCompletion(FlushReply completion);
+
+  std::shared_ptr<const BackendSet> backends() const;
+  std::string deviceID() const;
+
+  // Constant after construction.
+  const SessionServices _services;
+  VeltradSessionDelegate& _sessionDelegate;
+  const std::string _sessionIDString;  // base64 of 16 random bytes
+  char _deviceid[41] = {};             // NUL-terminated; all zero when the device has no identifier
+
+  // The connection's thread only.
+  std::shared_ptr<Connection> _connection;
+  std::optional<Array> _frameworks;  // kept, not interpreted
+
+  std::atomic<std::uint32_t> _sessionID{0};
+  std::atomic<bool> _hasAggregator{false};
+
+  mutable Mutex _mutex{LockRank::session};
+  SharedDictionary _sessionInfo GUARDED_BY(_mutex);
+  SharedDictionary _userInfo GUARDED_BY(_mutex);
+  std::shared_ptr<const BackendSet> _backends GUARDED_BY(_mutex);
+  std::optional<std::string> _storebagVersion GUARDED_BY(_mutex);
+};
+
+}  // namespace veltrad

@@ -1,0 +1,169 @@
+// The diagnostic message log: one current file, retired after a day.
+#include "support/message_log.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <cmath>
+#include <cstring>
+#include <ctime>
+#include <vector>
+
+#include "platform/clock.h"
+#include "platform/file_store.h"
+#include "platform/log.h"
+
+namespace veltrad {
+
+namespace {
+constexpr double kExpirySeconds = 86'400;
+constexpr std::string_view kPrefix = "veltrad_";
+constexpr std::string_view kSuffix = "_messageLog.diag";
+
+// The part between the underscores of a name that is one of the daemon's log files.
+std::optional<std::string_view> secondsInName(std::string_view name) {
+  if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix) ||
+      name.size() < kPrefix.size() + kSuffix.size()) {
+    return std::nullopt;
+  }
+  name.remove_prefix(kPrefix.size());
+  name.remove_suffix(kSuffix.size());
+  if (name.find('_') != std::string_view::npos) return std::nullopt;
+  return name;
+}
+
+// Of the birth time and the modification time the earlier; without a birth time the seconds in the name.
+std::optional<double> creationDate(const std::string& path) {
+  struct statx facts {};
+  if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &facts) != 0)
+    return std::nullopt;
+  const auto seconds = [](const struct statx_timestamp& time) {
+    return static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9;
+  };
+  if ((facts.stx_mask & STATX_BTIME) != 0)
+    return std::min(seconds(facts.stx_btime), seconds(facts.stx_mtime));
+  const auto digits = secondsInName(std::string_view(path).substr(path.rfind('/') + 1));
+  long long number = 0;
+  if (!digits || std::from_chars(digits->data(), digits->data() + digits->size(), number).ec != std::errc()) {
+    return std::nullopt;
+  }
+  return static_cast<double>(number);
+}
+
+std::string createdText(const std::optional<double>& created) {
+  return created ? dateDescription(*created) : "(null)";
+}
+
+// One write at the end of the file. False when anything failed.
+bool append(const std::string& path, const std::string& line) {
+  const int file = open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_CLOEXEC);
+  if (file < 0) return false;
+  const ssize_t written = write(file, line.data(), line.size());
+  const bool closed = close(file) == 0;
+  return closed && written == static_cast<ssize_t>(line.size());
+}
+}  // namespace
+
+std::string filledFormat(std::string_view format, std::initializer_list<std::string_view> values) {
+  std::string text;
+  const auto* value = values.begin();
+  for (std::size_t at = 0; at < format.size(); ++at) {
+    if (format.substr(at, 2) == "%@" && value != values.end()) {
+      text += *value++;
+      ++at;
+    } else {
+      text += format[at];
+    }
+  }
+  return text;
+}
+
+std::string dateDescription(double secondsSince1970) {
+  const auto whole = static_cast<std::time_t>(std::floor(secondsSince1970));
+  struct tm parts {};
+  gmtime_r(&whole, &parts);
+  char text[32];
+  const std::size_t length = strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S +0000", &parts);
+  return {text, length};
+}
+
+MessageLogFile::MessageLogFile(const platform::Clock& clock, std::string directory)
+    : _clock(clock), _directory(std::move(directory)) {}
+
+void MessageLogFile::writeToLogFile(std::string_view format, std::initializer_list<std::string_view> values) {
+  const Lock held(_mutex);
+  auto file = newestSurvivor();
+  if (!file) file = createFile();
+  if (!file) return;
+  const std::string line = fmt::format("({}) {}\n", dateDescription(platform::timevalToSeconds(_clock.now())),
+                                       filledFormat(format, values));
+  if (!append(file->path, line)) {
+    remove(*file);
+    return;
+  }
+  logInfo("writeToLogFile: Saved log message to %s", file->path.c_str());
+}
+
+std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
+  DIR* listing = opendir(_directory.c_str());
+  if (!listing && errno == ENOENT) {
+    logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
+    platform::makeDirectories(_directory);
+    return std::nullopt;
+  }
+  if (!listing) {
+    logError("writeToLogFile: Error reading from log directory: %s", std::strerror(errno));
+    return std::nullopt;
+  }
+  std::vector<std::string> names;
+  while (const dirent* entry = readdir(listing)) {
+    if (secondsInName(entry->d_name)) names.emplace_back(entry->d_name);
+  }
+  closedir(listing);
+  std::sort(names.begin(), names.end());
+
+  const double now = platform::timevalToSeconds(_clock.now());
+  std::optional<LogFile> newest;
+  for (const std::string& name : names) {
+    LogFile file{_directory + "/" + name, std::nullopt};
+    file.created = creationDate(file.path);
+    if (file.created && now - *file.created > kExpirySeconds) {
+      remove(file);
+    } else if (newest && newest->created) {
+      const bool later = file.created && *file.created > *newest->created;
+      remove(later ? *newest : file);
+      if (later) newest = file;
+    } else {
+      newest = file;
+    }
+  }
+  return newest;
+}
+
+std::optional<MessageLogFile::LogFile> MessageLogFile::createFile() {
+  LogFile file{fmt::format("{}/{}{}{}", _directory, kPrefix, _clock.now().seconds, kSuffix), std::nullopt};
+  const int made = open(file.path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+  if (made < 0) {
+    logError("writeToLogFile: Failed to create new veltrad log file %s", file.path.c_str());
+    return std::nullopt;
+  }
+  close(made);
+  file.created = creationDate(file.path);
+  logInfo("writeToLogFile: Created new veltrad log file %s (%s)", file.path.c_str(),
+          createdText(file.created).c_str());
+  return file;
+}
+
+void MessageLogFile::remove(const LogFile& file) {
+  unlink(file.path.c_str());
+  logInfo("writeToLogFile: Deleted expired veltrad log file %s (%s)", file.path.c_str(),
+          createdText(file.created).c_str());
+}
+
+}  // namespace veltrad
