@@ -1,0 +1,70 @@
+// What a call was answered, and the one line that says so. Plain values and pure functions; any thread.
+#include "tools/ctl/answers.h"
+
+#include <fmt/format.h>
+
+#include "base/json.h"
+
+namespace veltrad::ctl {
+namespace {
+
+std::string quoted(std::string_view text) {
+  return writeJSON(Value(text));
+}
+
+std::string formatReply(const std::optional<std::string>& reply) {
+  return reply ? quoted(*reply) : "null";
+}
+
+std::string formatBackends(const std::optional<std::vector<std::string>>& backends) {
+  if (!backends) return "null";
+  std::string text = "[";
+  for (const std::string& name : *backends) {
+    if (text.size() > 1) text += ',';
+    text += quoted(name);
+  }
+  return text + ']';
+}
+
+std::string formatError(const std::optional<AnswerError>& error) {
+  if (!error) return "null";
+  return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", quoted(error->domain), error->code,
+                     quoted(error->description));
+}
+
+}  // namespace
+
+Answer answerOfFailure(veltra_status status) {
+  Answer answer;
+  answer.status = status;
+  answer.error = AnswerError{"com.florn.veltra.error", -1, veltra_status_text(status)};
+  return answer;
+}
+
+std::string formatAnswer(Operation operation, const Answer& answer) {
+  std::string text = fmt::format(R"({{"op":"{}")", operationName(operation));
+  switch (operation) {
+    case Operation::start:
+    case Operation::restart:
+    case Operation::states:
+      text += ",\"backends\":" + formatBackends(answer.backends);
+      break;
+    case Operation::send:
+    case Operation::flush:
+    case Operation::displayURL:
+    case Operation::finish:
+      text += ",\"reply\":" + formatReply(answer.reply);
+      break;
+    case Operation::sleep:
+      break;
+  }
+  if (operation == Operation::flush || answer.status != VELTRA_OK)
+    text += ",\"error\":" + formatError(answer.error);
+  return text + '}';
+}
+
+std::string formatMalformedLine(std::uint64_t line, std::string_view description) {
+  return fmt::format(R"({{"op":"error","line":{},"description":{}}})", line, quoted(description));
+}
+
+}  // namespace veltrad::ctl

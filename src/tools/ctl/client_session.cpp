@@ -1,0 +1,144 @@
+// One session with the daemon, through the C interface. Own thread only.
+#include "tools/ctl/client_session.h"
+
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "tools/ctl/veltra_values.h"
+
+namespace veltrad::ctl {
+namespace {
+
+std::vector<std::string> textsOf(const veltra_value* array) {
+  std::vector<std::string> texts;
+  for (std::size_t index = 0; index < veltra_count(array); ++index) {
+    std::size_t length = 0;
+    const char* text = veltra_get_string(veltra_array_item(array, index), &length);
+    if (text) texts.emplace_back(text, length);
+  }
+  return texts;
+}
+
+Answer answerOf(const veltra_reply* reply) {
+  Answer answer;
+  answer.status = veltra_reply_status(reply);
+  std::size_t length = 0;
+  if (const char* text = veltra_reply_text(reply, &length)) answer.reply.emplace(text, length);
+  if (const veltra_value* backends = veltra_reply_backends(reply)) answer.backends = textsOf(backends);
+  const char* domain = veltra_reply_error_domain(reply);
+  const char* description = veltra_reply_error_description(reply);
+  if (domain && description) answer.error = AnswerError{domain, veltra_reply_error_code(reply), description};
+  if (answer.status != VELTRA_OK && !answer.error) answer.error = answerOfFailure(answer.status).error;
+  return answer;
+}
+
+}  // namespace
+
+ClientSession::ClientSession(Interrupt& interrupt)
+    : _interrupt(interrupt), _arrived(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
+
+ClientSession::~ClientSession() {
+  close();
+}
+
+std::optional<std::string> ClientSession::open(const std::optional<std::string>& root,
+                                               const Identity& identity) {
+  if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
+  const VeltraValue userInfo = toVeltraValue(identity.userInfo);
+  veltra_session_options options;
+  veltra_session_options_init(&options);
+  options.root = root ? root->c_str() : nullptr;
+  options.has_client_type = identity.clientType.has_value();
+  options.client_type = identity.clientType.value_or(0);
+  options.has_session_id = identity.sessionID.has_value();
+  options.session_id = identity.sessionID.value_or(0);
+  options.has_client_version = identity.clientVersion.has_value();
+  options.client_version = identity.clientVersion.value_or(0);
+  options.require_user_info = identity.requireUserInfo;
+  options.batch_events = identity.batchEvents;
+  options.user_info = userInfo.get();
+
+  veltra_status status = VELTRA_OK;
+  char* error = nullptr;
+  _session = veltra_session_create(&options, &status, &error);
+  if (_session) return std::nullopt;
+  std::string text = error ? error : veltra_status_text(status);
+  veltra_free(error);
+  return text;
+}
+
+std::optional<Answer> ClientSession::start() {
+  return await([this](veltra_callback callback, void* context) {
+    return veltra_session_start(_session, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::send(const Dictionary& message) {
+  const VeltraValue value = toVeltraValue(Value(message));
+  return await([this, &value](veltra_callback callback, void* context) {
+    return veltra_session_send_dictionary(_session, value.get(), callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::send(std::uint16_t category, std::uint16_t type,
+                                          const std::optional<Dictionary>& payload, std::uint32_t flag) {
+  const VeltraValue value = toVeltraValue(payload);
+  return await([&](veltra_callback callback, void* context) {
+    return veltra_session_send(_session, category, type, value.get(), flag, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::flush() {
+  return await([this](veltra_callback callback, void* context) {
+    return veltra_session_flush(_session, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::states(const std::optional<Dictionary>& userInfo) {
+  const VeltraValue value = toVeltraValue(userInfo);
+  return await([this, &value](veltra_callback callback, void* context) {
+    return veltra_session_states(_session, value.get(), callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::displayURL() {
+  return await([this](veltra_callback callback, void* context) {
+    return veltra_session_display_url(_session, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::finish() {
+  return await([this](veltra_callback callback, void* context) {
+    return veltra_session_finish(_session, callback, context);
+  });
+}
+
+std::uint64_t ClientSession::close() {
+  veltra_session* session = std::exchange(_session, nullptr);
+  return session ? veltra_session_close(session) : 0;
+}
+
+std::optional<Answer> ClientSession::await(const Call& call) {
+  const veltra_status status = call(&ClientSession::answered, this);
+  if (status != VELTRA_OK) return answerOfFailure(status);
+  if (_interrupt.wait(_arrived.get()) == Interrupt::Wake::interrupted) return std::nullopt;
+  eventfd_t arrived = 0;
+  eventfd_read(_arrived.get(), &arrived);
+  Lock lock(_mutex);
+  return std::exchange(_answer, std::nullopt);
+}
+
+void ClientSession::answered(void* context, const veltra_reply* reply) {
+  auto& self = *static_cast<ClientSession*>(context);
+  Answer answer = answerOf(reply);
+  {
+    Lock lock(self._mutex);
+    self._answer = std::move(answer);
+  }
+  eventfd_write(self._arrived.get(), 1);
+}
+
+}  // namespace veltrad::ctl

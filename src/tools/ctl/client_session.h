@@ -1,0 +1,59 @@
+// One session with the daemon, through the C interface. Own thread only.
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "base/mutex.h"
+#include "platform/file_descriptor.h"
+#include "tools/ctl/answers.h"
+#include "tools/ctl/interrupt.h"
+#include "tools/ctl/options.h"
+#include "veltra/veltra.h"
+
+namespace veltrad::ctl {
+
+// One call at a time, each waited for. A call that gives nothing was interrupted: then only close() makes
+// sense. The interrupt must outlive it.
+class ClientSession {
+ public:
+  explicit ClientSession(Interrupt& interrupt);
+  ~ClientSession();
+  ClientSession(const ClientSession&) = delete;
+  ClientSession& operator=(const ClientSession&) = delete;
+
+  // Connects. Nothing: done; else a text that says what is wrong and what to do. No root: the environment's.
+  std::optional<std::string> open(const std::optional<std::string>& root, const Identity& identity);
+
+  std::optional<Answer> start();
+  // "category", "type", "payload" and "flag" as they are.
+  std::optional<Answer> send(const Dictionary& message);
+  std::optional<Answer> send(std::uint16_t category, std::uint16_t type,
+                             const std::optional<Dictionary>& payload, std::uint32_t flag);
+  std::optional<Answer> flush();
+  std::optional<Answer> states(const std::optional<Dictionary>& userInfo);
+  std::optional<Answer> displayURL();
+  std::optional<Answer> finish();
+
+  // Waits for at most 2 s. Returns how many calls were lost unwritten.
+  std::uint64_t close();
+
+ private:
+  using Call = std::function<veltra_status(veltra_callback, void*)>;
+  std::optional<Answer> await(const Call& call);
+  // On the library's thread.
+  static void answered(void* context, const veltra_reply* reply);
+
+  // Constant after construction.
+  Interrupt& _interrupt;
+  const platform::FileDescriptor _arrived;  // an event descriptor
+  // Own thread only.
+  veltra_session* _session = nullptr;
+  // Guarded by _mutex.
+  Mutex _mutex{LockRank::leaf};
+  std::optional<Answer> _answer GUARDED_BY(_mutex);
+};
+
+}  // namespace veltrad::ctl

@@ -1,0 +1,22 @@
+// veltractl: talks to veltrad through libveltra, as any client does. The main thread.
+#include <cstdio>
+
+#include "tools/ctl/options.h"
+#include "tools/ctl/send_command.h"
+#include "tools/ctl/session_command.h"
+#include "tools/ctl/stats_command.h"
+
+int main(int argc, char** argv) {
+  using namespace veltrad::ctl;
+  const auto parsed = parseOptions(argc, argv);
+  if (const auto* ending = std::get_if<Ending>(&parsed)) {
+    std::fputs(ending->output.c_str(), stdout);
+    std::fputs(ending->errorOutput.c_str(), stderr);
+    return ending->status;
+  }
+  const Options& options = std::get<Options>(parsed);
+  if (options.command == Command::stats) return runStats(options);
+  Interrupt interrupt;  // before the library starts its threads
+  return options.command == Command::session ? runSession(options, interrupt)
+                                             : runOneCall(options, interrupt);
+}

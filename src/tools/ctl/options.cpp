@@ -1,0 +1,237 @@
+// The command line of veltractl, and the one file that sees CLI11: its exceptions end here. Any thread.
+#include "tools/ctl/options.h"
+
+#include <fmt/format.h>
+
+#include <CLI/CLI.hpp>
+#include <charconv>
+#include <limits>
+#include <sstream>
+#include <vector>
+
+#include "base/text.h"
+#include "tools/ctl/key_value.h"
+#include "veltra/veltra.h"
+
+namespace veltrad::ctl {
+namespace {
+
+constexpr int kWrongUsage = 2;
+constexpr const char* kExpectedCommands = "expected session, send, states, display-url or stats";
+
+// As they stand on the command line, before they are put together.
+struct Texts {
+  std::optional<std::string> client;
+  std::optional<std::string> service;
+  std::vector<std::string> userInfo;
+  std::vector<std::string> payload;
+};
+
+std::string keyValueProblem(const std::string& text) {
+  const auto entry = parseKeyValue(text);
+  return entry ? std::string() : entry.error();
+}
+
+std::string textProblem(const std::string& text) {
+  return isUTF8(text) ? std::string() : fmt::format("\"{}\": expected UTF-8", escapedForLog(text));
+}
+
+// Decimal, from 0 to `most`.
+template <typename T, typename Target>
+CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, T most,
+                       const std::string& help) {
+  const auto read = [name, &target, most](const std::string& text) {
+    T number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    if (error != std::errc() || end != text.data() + text.size() || number > most || text[0] == '-') {
+      throw CLI::ValidationError(
+          name, fmt::format("expected an integer from 0 to {}, found \"{}\"", most, escapedForLog(text)));
+    }
+    target = number;
+  };
+  return app.add_option_function<std::string>(name, read, help)->type_name("N");
+}
+
+void addText(CLI::App& app, const std::string& name, std::optional<std::string>& target,
+             const std::string& help) {
+  app.add_option(name, target, help)
+      ->type_name("NAME")
+      ->check(CLI::Validator(textProblem, ""))
+      ->group("Identity");
+}
+
+// `oneEach`: the words after the option belong to the command itself.
+void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) {
+  const char* group = "Identity";
+  addNumber<std::int32_t>(app, "--client-type", identity.clientType, 17, "Chooses what is reported, 0 to 17")
+      ->group(group);
+  addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, std::numeric_limits<std::uint32_t>::max(),
+                           "The client's own number for this session")
+      ->group(group);
+  addNumber<std::uint16_t>(app, "--client-version", identity.clientVersion,
+                           std::numeric_limits<std::uint16_t>::max(), "The client's version, 0 to 65535")
+      ->group(group);
+  addText(app, "--client", texts.client, "User info \"clientName\"");
+  addText(app, "--service", texts.service, "User info \"serviceName\"");
+  app.add_option(
+         "--user-info", texts.userInfo,
+         oneEach ? "More user info; repeat it for each entry" : "More user info, any number of entries")
+      ->type_name("KEY=VALUE")
+      ->check(CLI::Validator(keyValueProblem, ""))
+      ->group(group)
+      ->expected(1, oneEach ? 1 : CLI::detail::expected_max_vector_size)
+      ->allow_extra_args(!oneEach);
+  app.add_flag("--require-user-info", identity.requireUserInfo, "Report nothing without user info")
+      ->group(group);
+  app.add_flag("--batch-events", identity.batchEvents, "Let back ends collect events and post them together")
+      ->group(group);
+}
+
+constexpr const char* kSessionFooter = R"(One JSON object a line, answered by one line each, in order:
+  {"op":"send","category":5,"type":1,"payload":{"codec":"opus"},"flag":0}
+  {"op":"flush"}
+  {"op":"states","userInfo":{"clientName":"phone"}}
+  {"op":"displayURL"}
+  {"op":"restart"}            start again
+  {"op":"sleep","ms":100}
+  {"op":"finish"}             the end of the input closes without it
+{"$date": seconds since 1970} is a date, {"$data": "base64"} is data.
+
+Example:
+  echo '{"op":"flush"}' | veltractl session --client-type 7 --client phone --service ringer)";
+
+// Calls the one positional argument by its form and subcommands by their usual name.
+class Help : public CLI::Formatter {
+ public:
+  Help() {
+    label("SUBCOMMAND", "COMMAND");
+    column_width(34);
+  }
+  std::string make_option_name(const CLI::Option* option, bool positional) const override {
+    return positional ? "KEY=VALUE" : Formatter::make_option_name(option, positional);
+  }
+};
+
+CLI::App* addCommand(CLI::App& app, Options& options, Command command, const std::string& name,
+                     const std::string& help) {
+  CLI::App* added = app.add_subcommand(name, help)->group("Commands");
+  added->final_callback([&options, command] { options.command = command; });
+  return added;
+}
+
+void addSession(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* session =
+      addCommand(app, options, Command::session, "session", "Start a session and run one operation a line");
+  session->add_option("--input", options.input, "Read the lines from FILE instead of standard input")
+      ->type_name("FILE");
+  addIdentity(*session, options.identity, texts, false);
+  session->footer(kSessionFooter);
+}
+
+void addSend(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* send =
+      addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
+  addNumber<std::uint16_t>(*send, "--category", options.category, 65535,
+                           "What the message is about, 0 to 65535")
+      ->required();
+  addNumber<std::uint16_t>(*send, "--type", options.type, 65535, "Which message of the category, 0 to 65535")
+      ->required();
+  addNumber<std::uint32_t>(*send, "--flag", options.flag, std::numeric_limits<std::uint32_t>::max(),
+                           "1 at once, 2 whatever the sampling says, 3 both; 0 neither");
+  send->add_option("payload", texts.payload,
+                   "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
+                   "false booleans, everything else a text")
+      ->type_name("")
+      ->check(CLI::Validator(keyValueProblem, ""));
+  addIdentity(*send, options.identity, texts, true);
+  send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
+}
+
+void addQuestions(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* states =
+      addCommand(app, options, Command::states, "states", "Show which back ends report for a session");
+  addIdentity(*states, options.identity, texts, false);
+  states->footer("Example:\n  veltractl states --client-type 7 --client phone --service ringer");
+
+  CLI::App* url = addCommand(app, options, Command::displayURL, "display-url",
+                             "Show where a session's reports can be looked at");
+  addIdentity(*url, options.identity, texts, false);
+  url->footer("Example:\n  veltractl display-url --client-type 7");
+
+  CLI::App* stats = addCommand(app, options, Command::stats, "stats",
+                               "Show what happened to messages, by reason, with counts");
+  stats->footer("Examples:\n  veltractl stats\n  veltractl --json stats");
+}
+
+void addGlobals(CLI::App& app, Options& options) {
+  app.add_option("--root", options.root, "Directory that holds run/veltrad [VELTRA_ROOT, else /]")
+      ->type_name("DIR")
+      ->check(CLI::Validator(
+          [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
+          ""));
+  app.add_flag("--json", options.json, "Print stats as JSON; the other commands always do");
+  app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
+  app.set_help_flag("-h,--help", "Print this help");
+  app.require_subcommand(1);
+  app.fallthrough();
+  app.formatter(std::make_shared<Help>());
+  app.footer(
+      "Exit status: 0 done, 1 the daemon refused or failed, 2 wrong usage.\n"
+      "`veltractl COMMAND --help` says more.\n\n"
+      "Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
+}
+
+// What CLI11 says, in better words where it says little.
+std::string problemOf(const CLI::App& app, const CLI::ParseError& error) {
+  const std::vector<std::string> left = app.remaining(true);
+  const bool noCommand = app.get_subcommands().empty();
+  const auto code = static_cast<CLI::ExitCodes>(error.get_exit_code());
+  const std::string first = left.empty() ? std::string() : escapedForLog(left[0]);
+  if (code == CLI::ExitCodes::ExtrasError) return fmt::format("\"{}\" is not expected here", first);
+  if (code != CLI::ExitCodes::RequiredError || !noCommand) return error.what();
+  if (left.empty()) return fmt::format("no command: {}", kExpectedCommands);
+  return fmt::format("unknown {} \"{}\": {}", first[0] == '-' ? "option" : "command", first,
+                     kExpectedCommands);
+}
+
+// Help and version are thrown, too.
+Ending endingOf(const CLI::App& app, const CLI::ParseError& error) {
+  if (error.get_exit_code() != 0) {
+    return Ending{kWrongUsage, "",
+                  fmt::format("veltractl: {}\nSee veltractl --help.\n", problemOf(app, error))};
+  }
+  std::ostringstream output;
+  app.exit(error, output, output);
+  return Ending{0, output.str(), ""};
+}
+
+// The texts have passed their checks.
+void putTogether(const Texts& texts, Options& options) {
+  if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
+  if (!texts.client && !texts.service && texts.userInfo.empty()) return;
+  Dictionary userInfo = parseKeyValues(texts.userInfo).value();
+  userInfo.setIfPresent("clientName", texts.client);
+  userInfo.setIfPresent("serviceName", texts.service);
+  options.identity.userInfo = std::move(userInfo);
+}
+
+}  // namespace
+
+std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
+  Options options;
+  Texts texts;
+  CLI::App app("Talk to veltrad: start sessions, send messages, see what became of them.", "veltractl");
+  addGlobals(app, options);
+  addSession(app, options, texts);
+  addSend(app, options, texts);
+  addQuestions(app, options, texts);
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& error) {
+    return endingOf(app, error);
+  }
+  putTogether(texts, options);
+  return options;
+}
+
+}  // namespace veltrad::ctl

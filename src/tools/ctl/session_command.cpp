@@ -1,0 +1,128 @@
+// `veltractl session`. The main thread.
+#include "tools/ctl/session_command.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "tools/ctl/client_session.h"
+#include "tools/ctl/line_reader.h"
+#include "tools/ctl/print.h"
+#include "tools/ctl/session_lines.h"
+
+namespace veltrad::ctl {
+namespace {
+
+// What follows a line: the next one, or the end with this exit status.
+using Ended = std::optional<int>;
+
+class SessionRun {
+ public:
+  SessionRun(ClientSession& session, Interrupt& interrupt) : _session(session), _interrupt(interrupt) {}
+
+  Ended start() {
+    const auto answer = _session.start();
+    if (!answer) return 0;
+    if (answer->status != VELTRA_OK) {
+      complain(answer->error->description);
+      return 1;
+    }
+    return print(formatAnswer(Operation::start, *answer));
+  }
+
+  Ended run(std::uint64_t number, const std::string& text) {
+    const auto line = parseSessionLine(text);
+    if (!line) return malformed(number, line.error());
+    const Operation operation = line.value().operation;
+    const auto answer = answerTo(line.value());
+    if (!answer) return 0;
+    const Ended ended = print(formatAnswer(operation, *answer));
+    if (ended || answer->status != VELTRA_NO_DAEMON) return ended;
+    complain("the connection to veltrad has ended: is it still running?");
+    return 1;
+  }
+
+  Ended malformed(std::uint64_t number, std::string_view description) {
+    return print(formatMalformedLine(number, description));
+  }
+
+ private:
+  // Nothing when the user interrupts.
+  std::optional<Answer> answerTo(const SessionLine& line) {
+    switch (line.operation) {
+      case Operation::start:
+      case Operation::restart:
+        return _session.start();
+      case Operation::send:
+        return _session.send(line.message);
+      case Operation::flush:
+        return _session.flush();
+      case Operation::states:
+        return _session.states(line.userInfo);
+      case Operation::displayURL:
+        return _session.displayURL();
+      case Operation::finish:
+        return _session.finish();
+      case Operation::sleep:
+        if (_interrupt.wait(-1, line.duration) == Interrupt::Wake::interrupted) return std::nullopt;
+        return Answer();
+    }
+    return std::nullopt;
+  }
+
+  static Ended print(const std::string& line) { return printLine(line) ? Ended() : Ended(1); }
+
+  ClientSession& _session;
+  Interrupt& _interrupt;
+};
+
+int runLines(SessionRun& run, LineReader& lines) {
+  for (;;) {
+    Ended ended;
+    switch (lines.next()) {
+      case LineReader::Got::line:
+        if (!isBlankLine(lines.line())) ended = run.run(lines.number(), lines.line());
+        break;
+      case LineReader::Got::tooLong:
+        ended = run.malformed(lines.number(),
+                              fmt::format("the line is too long: expected at most {} bytes", kLongestLine));
+        break;
+      case LineReader::Got::end:
+      case LineReader::Got::interrupted:
+        return 0;
+      case LineReader::Got::failed:
+        complain(fmt::format("cannot read the input: {}", std::strerror(errno)));
+        return 2;
+    }
+    if (ended) return *ended;
+  }
+}
+
+}  // namespace
+
+int runSession(const Options& options, Interrupt& interrupt) {
+  platform::FileDescriptor file;
+  if (options.input) {
+    file = platform::FileDescriptor(open(options.input->c_str(), O_RDONLY | O_CLOEXEC));
+    if (file.get() < 0) {
+      complain(fmt::format("--input {}: {}", *options.input, std::strerror(errno)));
+      return 2;
+    }
+  }
+  ClientSession session(interrupt);
+  if (const auto problem = session.open(options.root, options.identity)) {
+    complain(*problem);
+    return 1;
+  }
+  SessionRun run(session, interrupt);
+  const Ended refused = run.start();
+  LineReader lines(options.input ? file.get() : STDIN_FILENO, kLongestLine, interrupt);
+  const int status = refused ? *refused : runLines(run, lines);
+  if (const std::uint64_t lost = session.close()) complain(fmt::format("{} calls were lost unsent", lost));
+  return status;
+}
+
+}  // namespace veltrad::ctl

@@ -1,0 +1,149 @@
+// Reads one line of `veltractl session`. Pure functions; any thread.
+#include "tools/ctl/session_lines.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+
+#include "base/json.h"
+
+namespace veltrad::ctl {
+namespace {
+
+constexpr Operation kOperations[] = {Operation::send,       Operation::flush,   Operation::states,
+                                     Operation::displayURL, Operation::restart, Operation::sleep,
+                                     Operation::finish};
+constexpr const char* kExpectedOperations =
+    "expected one of send, flush, states, displayURL, restart, sleep, finish";
+
+const char* typeName(const Value& value) {
+  switch (value.type()) {
+    case Value::Type::boolean:
+      return "a boolean";
+    case Value::Type::signedInteger:
+    case Value::Type::unsignedInteger:
+      return "an integer";
+    case Value::Type::real:
+      return "a number with a fraction";
+    case Value::Type::string:
+      return "a text";
+    case Value::Type::date:
+      return "a date";
+    case Value::Type::data:
+      return "data";
+    case Value::Type::array:
+      return "an array";
+    case Value::Type::dictionary:
+      return "an object";
+  }
+  return "something else";
+}
+
+// The C interface takes keys that end at their first NUL.
+bool hasUnsendableKey(const Value& value) {
+  if (const Array* array = value.asArray())
+    return std::any_of(array->begin(), array->end(), hasUnsendableKey);
+  const Dictionary* dictionary = value.asDictionary();
+  return dictionary &&
+         std::any_of(dictionary->begin(), dictionary->end(), [](const Dictionary::Entry& entry) {
+           return entry.first.find('\0') != std::string::npos || hasUnsendableKey(entry.second);
+         });
+}
+
+// What is wrong with the field; nothing when it is absent or an object.
+std::optional<std::string> objectProblem(Operation operation, const Dictionary& line, const char* key) {
+  const Value* value = line.find(key);
+  if (!value || value->asDictionary()) return std::nullopt;
+  return fmt::format("\"{}\" of {}: expected an object, found {}", key, operationName(operation),
+                     typeName(*value));
+}
+
+bool isInteger(const Value& value) {
+  return value.type() == Value::Type::signedInteger || value.type() == Value::Type::unsignedInteger;
+}
+
+Result<SessionLine, std::string> parseSend(Dictionary line) {
+  if (auto problem = objectProblem(Operation::send, line, "payload")) return Failure{*problem};
+  const Value* flag = line.find("flag");
+  if (flag && !isInteger(*flag)) {
+    return Failure{fmt::format("\"flag\" of send: expected an integer, found {}", typeName(*flag))};
+  }
+  SessionLine result;
+  result.operation = Operation::send;
+  line.erase("op");
+  result.message = std::move(line);
+  return result;
+}
+
+Result<SessionLine, std::string> parseStates(const Dictionary& line) {
+  if (auto problem = objectProblem(Operation::states, line, "userInfo")) return Failure{*problem};
+  SessionLine result;
+  result.operation = Operation::states;
+  if (const Dictionary* userInfo = line.dictionary("userInfo")) result.userInfo = *userInfo;
+  return result;
+}
+
+Result<SessionLine, std::string> parseSleep(const Dictionary& line) {
+  const std::string expected = fmt::format("expected an integer from 0 to {}", kLongestSleep.count());
+  const Value* ms = line.find("ms");
+  if (!ms) return Failure{fmt::format("no \"ms\" in sleep: {}", expected)};
+  const auto count = isInteger(*ms) ? ms->toInt64() : std::nullopt;
+  if (!count) return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, typeName(*ms))};
+  if (*count < 0 || *count > kLongestSleep.count()) {
+    return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, writeJSON(*ms))};
+  }
+  SessionLine result;
+  result.operation = Operation::sleep;
+  result.duration = std::chrono::milliseconds(*count);
+  return result;
+}
+
+Result<Operation, std::string> operationOf(const Dictionary& line) {
+  const Value* op = line.find("op");
+  if (!op) return Failure{fmt::format("no \"op\": {}", kExpectedOperations)};
+  const std::string* name = op->asString();
+  if (!name) return Failure{fmt::format("\"op\": expected a text, found {}", typeName(*op))};
+  for (Operation operation : kOperations) {
+    if (*name == operationName(operation)) return operation;
+  }
+  return Failure{fmt::format("unknown op {}: {}", writeJSON(*op), kExpectedOperations)};
+}
+
+}  // namespace
+
+bool isBlankLine(std::string_view line) {
+  return line.find_first_not_of(" \t\r\n") == std::string_view::npos;
+}
+
+Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
+  if (line.size() > kLongestLine) {
+    return Failure{fmt::format("the line is too long: expected at most {} bytes", kLongestLine)};
+  }
+  const auto json = parseJSON(line);
+  if (!json)
+    return Failure{fmt::format("not JSON: at byte {}: {}", json.error().offset, json.error().detail)};
+  const Dictionary* fields = json.value().asDictionary();
+  if (!fields) {
+    return Failure{
+        fmt::format("expected an object such as {{\"op\":\"flush\"}}, found {}", typeName(json.value()))};
+  }
+  const auto operation = operationOf(*fields);
+  if (!operation) return Failure{operation.error()};
+  if (hasUnsendableKey(json.value()))
+    return Failure{std::string("a key holds a NUL character: expected none")};
+  switch (operation.value()) {
+    case Operation::send:
+      return parseSend(*fields);
+    case Operation::states:
+      return parseStates(*fields);
+    case Operation::sleep:
+      return parseSleep(*fields);
+    default:
+      break;
+  }
+  SessionLine result;
+  result.operation = operation.value();
+  return result;
+}
+
+}  // namespace veltrad::ctl
