@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "base/value.h"
 
@@ -52,15 +53,18 @@ class FrameReader {
   // Where the next bytes go: at least `least` bytes of room. Then received() says how many came.
   std::pair<char*, std::size_t> room(std::size_t least = 4096);
   void received(std::size_t count);
-  // The next whole frame; `impossible` is final. `frame` is set only for Next::frame.
+  // The next whole frame; `impossible` is final, and the first time `frame` holds the header that was.
   Next next(Frame& frame);
   // A header has come but not yet its whole body.
   bool inFrame() const;
+  // Nothing has come that was not handed out.
+  bool empty() const { return _taken == _filled; }
 
  private:
-  std::string _buffer;
-  std::size_t _filled = 0;
-  std::size_t _taken = 0;
+  std::string _buffer;      // its size is the room there is
+  std::size_t _filled = 0;  // bytes that came
+  std::size_t _taken = 0;   // of these, the ones already handed out in frames
+  bool _impossible = false;
 };
 
 }  // namespace veltrad::ipc

@@ -9,11 +9,11 @@
 #include <vector>
 
 #include "base/mutex.h"
-#include "ipc/descriptor.h"
 #include "ipc/service_socket.h"
 #include "ipc/thread.h"
 #include "platform/counters.h"
 #include "platform/entitlements.h"
+#include "platform/file_descriptor.h"
 #include "protocol/connection.h"
 
 namespace veltrad {
@@ -63,15 +63,17 @@ class Listener {
 
   void acceptLoop();
   void acceptOne();
-  void acceptWithSpare();
-  void serve(ipc::Descriptor socket);
+  void acceptWithSpare(int error);
+  void pause(int error);
+  void warnOfAccept(int error);
+  void admit(platform::FileDescriptor socket);
   std::optional<std::string> boundReached(unsigned uid);
-  void admit(ipc::Descriptor socket, platform::Peer peer);
-  void runConnection(std::uint64_t number, std::shared_ptr<ipc::SocketConnection> connection);
-  void ended(std::uint64_t number);
+  bool startClient(std::uint64_t number, unsigned uid,
+                   const std::shared_ptr<ipc::SocketConnection>& connection);
   void reap();
   void wake();
-  void warnOfAccept(int error);
+  void runConnection(std::uint64_t number, ipc::SocketConnection& connection);
+  void forget(std::uint64_t number) REQUIRES(_mutex);
 
   // Constant after construction.
   ListenerDelegate& _delegate;
@@ -80,11 +82,11 @@ class Listener {
   const std::string _entitlementsPath;
   const std::size_t _mostConnections;
   const std::size_t _mostConnectionsOfOneUser;
-  const ipc::Descriptor _wakeUp;
+  const platform::FileDescriptor _wakeUp;
 
   // The accepting thread's while it runs, else the owner's.
   ipc::ServiceSocket _socket;
-  ipc::Descriptor _spare;
+  platform::FileDescriptor _spare;
   std::chrono::steady_clock::time_point _lastWarning{};
   std::uint64_t _nextNumber = 1;
 

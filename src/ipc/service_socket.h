@@ -6,7 +6,7 @@
 #include <string>
 
 #include "base/result.h"
-#include "ipc/descriptor.h"
+#include "platform/file_descriptor.h"
 #include "platform/root.h"
 
 namespace veltrad::ipc {
@@ -15,7 +15,7 @@ namespace veltrad::ipc {
 class ServiceSocket {
  public:
   // `madePath`: the socket's file, where this process made it; empty for a socket that was handed over.
-  ServiceSocket(Descriptor listening, Descriptor lock, std::string madePath)
+  ServiceSocket(platform::FileDescriptor listening, platform::FileDescriptor lock, std::string madePath)
       : _listening(std::move(listening)), _lock(std::move(lock)), _madePath(std::move(madePath)) {}
   ServiceSocket(ServiceSocket&&) = default;
   ServiceSocket& operator=(ServiceSocket&&) = delete;
@@ -27,8 +27,8 @@ class ServiceSocket {
   void close();
 
  private:
-  Descriptor _listening;
-  Descriptor _lock;
+  platform::FileDescriptor _listening;
+  platform::FileDescriptor _lock;
   std::string _madePath;
 };
 

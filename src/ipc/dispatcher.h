@@ -1,0 +1,24 @@
+// From a call's frame to the session's operation. The connection's own thread.
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "base/result.h"
+#include "ipc/frame.h"
+#include "ipc/out_queue.h"
+#include "protocol/client_session_interface.h"
+
+namespace veltrad::ipc {
+
+// Runs the call that the frame holds on `session`; its replies go to `out`. When the frame holds no readable
+// call, nothing runs and the answer says in one sentence what is wrong with it: "unknown operation "x"",
+// "argument "category" must be a number". Format: docs/wire-protocol.md.
+std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
+                                        const std::shared_ptr<OutQueue>& out);
+
+// The dictionary in a frame's body, or what is wrong with it.
+Result<Dictionary, std::string> decodeFrameBody(const Frame& frame);
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,253 @@
+// Accepting, bounding, reaping. Each function says in listener.h or here whose thread runs it.
+#include "ipc/listener.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "ipc/out_queue.h"
+#include "ipc/socket_connection.h"
+#include "platform/log.h"
+#include "platform/peer.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+namespace {
+
+using platform::FileDescriptor;
+
+// How long the accepting thread rests when the system has no descriptor or memory left.
+constexpr int kPauseMilliseconds = 100;
+
+FileDescriptor openSpare() {
+  return FileDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+}
+
+std::string refusedPeer(const platform::Peer& peer, const std::string& entitlementsPath) {
+  return fmt::format(
+      "Connection refused: this peer (uid {}, gid {}, unit {}) does not hold the entitlement \"{}\"; add a "
+      "rule for it "
+      "to {}.",
+      peer.uid, peer.gids.empty() ? std::string("unknown") : std::to_string(peer.gids.front()),
+      peer.unit.value_or("none"), kVeltraEntitlement, entitlementsPath);
+}
+
+// A peer that gets no connection is told why all the same; its queue is empty, so this cannot block.
+void refuseSocket(FileDescriptor socket, const std::string& description) {
+  const std::string frame = ipc::refusalFrame(description);
+  ::send(socket.get(), frame.data(), frame.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+  ipc::closeGently(std::move(socket));
+}
+
+}  // namespace
+
+Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
+    : _delegate(delegate),
+      _entitlements(options.entitlements),
+      _counters(options.counters),
+      _entitlementsPath(std::move(options.entitlementsPath)),
+      _mostConnections(options.mostConnections),
+      _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
+      _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
+      _socket(std::move(options.socket)),
+      _spare(openSpare()) {}
+
+Listener::~Listener() {
+  invalidate(std::chrono::steady_clock::now());
+  {
+    Lock lock(_mutex);
+    while (!_clients.empty()) _changed.wait(_mutex);
+  }
+  reap();
+}
+
+bool Listener::resume() {
+  if (!_wakeUp.isOpen() ||
+      !_acceptThread.start("accept", ipc::kConnectionStackBytes, [this] { acceptLoop(); })) {
+    logError("listener: No thread or descriptor for accepting connections");
+    return false;
+  }
+  return true;
+}
+
+std::size_t Listener::invalidate(std::chrono::steady_clock::time_point deadline) {
+  {
+    Lock lock(_mutex);
+    _stopping = true;
+  }
+  wake();
+  _acceptThread.join();
+  _socket.close();
+  std::vector<std::shared_ptr<ipc::SocketConnection>> connections;
+  {
+    Lock lock(_mutex);
+    for (const auto& [number, client] : _clients) connections.push_back(client.connection);
+  }
+  for (const auto& connection : connections) connection->stop(deadline);
+  connections.clear();
+  std::size_t left = 0;
+  {
+    Lock lock(_mutex);
+    while (!_clients.empty() && _changed.waitUntil(_mutex, deadline)) {
+    }
+    left = _clients.size();
+  }
+  reap();
+  return left;
+}
+
+void Listener::wake() {
+  const std::uint64_t one = 1;
+  [[maybe_unused]] const ssize_t written = ::write(_wakeUp.get(), &one, sizeof one);
+}
+
+// The accepting thread, from here to reap().
+void Listener::acceptLoop() {
+  while (true) {
+    pollfd watched[] = {{_socket.listening(), POLLIN, 0}, {_wakeUp.get(), POLLIN, 0}};
+    ::poll(watched, 2, -1);
+    if (watched[1].revents != 0) {
+      std::uint64_t count = 0;
+      [[maybe_unused]] const ssize_t read = ::read(_wakeUp.get(), &count, sizeof count);
+      reap();
+      Lock lock(_mutex);
+      if (_stopping) return;
+    }
+    if (watched[0].revents != 0) acceptOne();
+  }
+}
+
+void Listener::acceptOne() {
+  FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
+  if (socket.isOpen()) return admit(std::move(socket));
+  switch (errno) {
+    case EAGAIN:
+    case EINTR:
+    case ECONNABORTED:
+      return;
+    case EMFILE:
+    case ENFILE:
+      return acceptWithSpare(errno);
+    default:
+      return pause(errno);
+  }
+}
+
+// The table of descriptors is full: the spare one lets this client be told, and the queue move on.
+void Listener::acceptWithSpare(int error) {
+  warnOfAccept(error);
+  _counters.count("connection refused: no descriptor is left");
+  _spare.reset();
+  FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
+  if (socket.isOpen()) {
+    refuseSocket(std::move(socket),
+                 "Connection refused: the daemon has no descriptor left; try again later.");
+  }
+  _spare = openSpare();
+  if (!_spare.isOpen()) pause(error);
+}
+
+// Nothing can be accepted for now; trying again at once would only burn time.
+void Listener::pause(int error) {
+  warnOfAccept(error);
+  pollfd watched{_wakeUp.get(), POLLIN, 0};
+  ::poll(&watched, 1, kPauseMilliseconds);
+}
+
+void Listener::warnOfAccept(int error) {
+  const auto now = std::chrono::steady_clock::now();
+  if (now - _lastWarning < std::chrono::seconds(1)) return;
+  _lastWarning = now;
+  logWarning("listener: A connection could not be accepted: %s", std::strerror(error));
+}
+
+void Listener::admit(FileDescriptor socket) {
+  auto peer = platform::peerOfSocket(socket.get());
+  if (!peer) {
+    _counters.count("connection refused: the kernel does not say who it is");
+    return refuseSocket(std::move(socket),
+                        "Connection refused: the kernel does not say who you are: " + peer.error());
+  }
+  const unsigned uid = peer.value().uid;
+  if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
+  const std::uint64_t number = _nextNumber++;
+  auto connection = std::make_shared<ipc::SocketConnection>(
+      number, std::move(socket), std::move(peer.value()), _entitlements, _counters);
+  if (connection->usable() && startClient(number, uid, connection)) return;
+  _counters.count("connection refused: no thread or descriptor is left");
+  connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");
+  warnOfAccept(EAGAIN);
+}
+
+std::optional<std::string> Listener::boundReached(unsigned uid) {
+  bool all = false;
+  {
+    Lock lock(_mutex);
+    all = _clients.size() >= _mostConnections;
+    const auto mine = _clientsOfUser.find(uid);
+    if (!all && (mine == _clientsOfUser.end() || mine->second < _mostConnectionsOfOneUser))
+      return std::nullopt;
+  }
+  if (all) {
+    _counters.count("connection refused: too many connections");
+    return fmt::format("Connection refused: {} connections are open, and no more are taken.",
+                       _mostConnections);
+  }
+  _counters.count("connection refused: too many connections of one user");
+  return fmt::format("Connection refused: uid {} has {} connections open, and no more are taken of one user.",
+                     uid, _mostConnectionsOfOneUser);
+}
+
+bool Listener::startClient(std::uint64_t number, unsigned uid,
+                           const std::shared_ptr<ipc::SocketConnection>& connection) {
+  // The thread's last act takes the lock, so it finds its entry whole.
+  Lock lock(_mutex);
+  Client& client = _clients[number];
+  client.connection = connection;
+  client.uid = uid;
+  ++_clientsOfUser[uid];
+  const bool started =
+      client.thread.start("connection", ipc::kConnectionStackBytes,
+                          [this, number, connection] { runConnection(number, *connection); });
+  if (!started) forget(number);
+  return started;
+}
+
+void Listener::reap() {
+  std::vector<ipc::Thread> finished;
+  {
+    Lock lock(_mutex);
+    finished.swap(_finished);
+  }
+  for (ipc::Thread& thread : finished) thread.join();
+}
+
+// The connection's own thread, from here on.
+void Listener::runConnection(std::uint64_t number, ipc::SocketConnection& connection) {
+  if (_delegate.listener(*this, connection.shared_from_this())) {
+    connection.run();
+  } else {
+    _counters.count("connection refused: the peer does not hold the entitlement");
+    connection.refuse(refusedPeer(connection.peer(), _entitlementsPath));
+  }
+  Lock lock(_mutex);
+  _finished.push_back(std::move(_clients[number].thread));
+  forget(number);
+  _changed.notifyAll();
+  wake();
+}
+
+void Listener::forget(std::uint64_t number) {
+  const auto client = _clients.find(number);
+  const auto count = _clientsOfUser.find(client->second.uid);
+  if (--count->second == 0) _clientsOfUser.erase(count);
+  _clients.erase(client);
+}
+
+}  // namespace veltrad

@@ -1,0 +1,164 @@
+// Frames on their way out. See out_queue.h for who runs what.
+#include "ipc/out_queue.h"
+
+#include <sys/eventfd.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstdint>
+
+#include "ipc/frame.h"
+
+namespace veltrad::ipc {
+
+static_assert(kOutQueueBound == kFrameBodyLimit + kFrameHeaderBytes);
+
+namespace {
+
+// A client that goes on writing while it is shut out could keep us reading: so many reads at most.
+constexpr int kMostDrainingReads = 1024;
+// An empty queue keeps no more than this.
+constexpr std::size_t kKeptBytes = 16u << 10;
+
+}  // namespace
+
+OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters)
+    : _counters(counters), _readSocket(socket.get()), _readWakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+  Lock lock(_mutex);
+  _socket = std::move(socket);
+  _wakeUp = platform::FileDescriptor(_readWakeUp);
+  _gone = !_socket.isOpen();
+}
+
+OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
+  const Sent sent = put(frame);
+  if (sent == Sent::full) {
+    _counters.count("connection ended: the client does not read its replies");
+    requestEnd();
+  } else if (sent == Sent::gone) {
+    _counters.count("reply dropped: the client has gone");
+  }
+  return sent;
+}
+
+OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
+  const Sent sent = put(frame);
+  if (sent == Sent::full) {
+    _counters.count("event dropped: the client does not read");
+  } else if (sent == Sent::gone) {
+    _counters.count("event dropped: the client has gone");
+  } else if (sent == Sent::tooLarge) {
+    _counters.count("event dropped: larger than a frame may be");
+  }
+  return sent;
+}
+
+OutQueue::Sent OutQueue::put(std::string_view frame) {
+  if (frame.size() > kFrameBodyLimit + kFrameHeaderBytes) return Sent::tooLarge;
+  Lock lock(_mutex);
+  if (_gone) return Sent::gone;
+  if (_waiting.empty()) {
+    if (!writeSome(frame)) return Sent::gone;
+    if (frame.empty()) return Sent::done;
+    _waiting.assign(frame);
+    _waitingBytes.store(_waiting.size(), std::memory_order_relaxed);
+    wake();
+    return Sent::done;
+  }
+  if (_waiting.size() - _written + frame.size() > kOutQueueBound) return Sent::full;
+  if (_written > _waiting.size() / 2) {
+    _waiting.erase(0, _written);
+    _written = 0;
+  }
+  _waiting.append(frame);
+  _waitingBytes.store(_waiting.size() - _written, std::memory_order_relaxed);
+  return Sent::done;
+}
+
+// Takes what was written off `bytes`. False: the client has gone.
+bool OutQueue::writeSome(std::string_view& bytes) {
+  while (!bytes.empty()) {
+    const ssize_t count = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (count >= 0) {
+      bytes.remove_prefix(static_cast<std::size_t>(count));
+    } else if (errno == EAGAIN || errno == EWOULDBLOCK || errno == ENOBUFS || errno == ENOMEM) {
+      return true;
+    } else if (errno != EINTR) {
+      giveUp();
+      return false;
+    }
+  }
+  return true;
+}
+
+void OutQueue::requestEnd() {
+  _endRequested.store(true, std::memory_order_relaxed);
+  Lock lock(_mutex);
+  wake();
+}
+
+void OutQueue::stopReading() {
+  Lock lock(_mutex);
+  if (_socket.isOpen()) ::shutdown(_socket.get(), SHUT_RD);
+  wake();
+}
+
+void OutQueue::wake() {
+  if (!_wakeUp.isOpen()) return;
+  const std::uint64_t one = 1;
+  // Full means that a wake-up is already waiting.
+  [[maybe_unused]] const ssize_t written = ::write(_wakeUp.get(), &one, sizeof one);
+}
+
+void OutQueue::drainWakeUp() {
+  std::uint64_t count = 0;
+  [[maybe_unused]] const ssize_t read = ::read(_readWakeUp, &count, sizeof count);
+}
+
+// Nothing more can be written.
+void OutQueue::giveUp() {
+  _gone = true;
+  _waiting = std::string();
+  _written = 0;
+  _waitingBytes.store(0, std::memory_order_relaxed);
+}
+
+std::size_t OutQueue::flush() {
+  if (waitingBytes() == 0) return 0;
+  Lock lock(_mutex);
+  std::string_view rest = std::string_view(_waiting).substr(_written);
+  if (!writeSome(rest)) return 0;
+  _written = _waiting.size() - rest.size();
+  _waitingBytes.store(rest.size(), std::memory_order_relaxed);
+  if (!rest.empty()) return rest.size();
+  _written = 0;
+  if (_waiting.capacity() > kKeptBytes) {
+    _waiting = std::string();
+  } else {
+    _waiting.clear();
+  }
+  return 0;
+}
+
+void OutQueue::close() {
+  platform::FileDescriptor socket;
+  {
+    Lock lock(_mutex);
+    giveUp();
+    socket = std::move(_socket);
+    _wakeUp.reset();
+  }
+  if (socket.isOpen()) closeGently(std::move(socket));
+}
+
+void closeGently(platform::FileDescriptor socket) {
+  // Once shut down the peer can write no more; an empty receive queue then makes the close an orderly one.
+  ::shutdown(socket.get(), SHUT_RDWR);
+  char bytes[4096];
+  for (int i = 0; i < kMostDrainingReads; ++i) {
+    const ssize_t count = ::recv(socket.get(), bytes, sizeof bytes, MSG_DONTWAIT);
+    if (count == 0 || (count < 0 && errno != EINTR)) return;
+  }
+}
+
+}  // namespace veltrad::ipc

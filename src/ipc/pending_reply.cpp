@@ -1,0 +1,87 @@
+// From results to reply frames. Any thread.
+#include "ipc/pending_reply.h"
+
+#include <fmt/format.h>
+
+#include "ipc/frame.h"
+
+namespace veltrad::ipc {
+
+PendingReply::~PendingReply() {
+  if (!_answered.load(std::memory_order_acquire)) fail(makeReportingError("The daemon gave no reply.", -1));
+}
+
+void PendingReply::answer(Dictionary results) {
+  if (_answered.exchange(true, std::memory_order_acq_rel)) return;
+  Dictionary body;
+  body.set("results", std::move(results));
+  send(std::move(body));
+}
+
+void PendingReply::fail(const ReportingError& error) {
+  if (_answered.exchange(true, std::memory_order_acq_rel)) return;
+  send({{"error", dictionaryOfError(error)}});
+}
+
+void PendingReply::send(Dictionary body) {
+  const std::string frame = makeFrame(FrameKind::reply, _callID, std::move(body));
+  if (_out->sendReply(frame) != OutQueue::Sent::tooLarge) return;
+  const ReportingError error =
+      makeReportingError(fmt::format("The reply of {} bytes is larger than a frame may be ({} bytes).",
+                                     frame.size() - kFrameHeaderBytes, kFrameBodyLimit),
+                         -1);
+  _out->sendReply(makeFrame(FrameKind::reply, _callID, {{"error", dictionaryOfError(error)}}));
+}
+
+namespace {
+
+void setError(Dictionary& results, const std::optional<ReportingError>& error) {
+  if (error) results.set("error", dictionaryOfError(*error));
+}
+
+}  // namespace
+
+StringReply stringReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return [pending = std::move(pending)](std::optional<std::string> text) {
+    Dictionary results;
+    if (text) results.set("reply", std::move(*text));
+    pending->answer(std::move(results));
+  };
+}
+
+NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return [pending = std::move(pending)](std::optional<std::vector<std::string>> names) {
+    Dictionary results;
+    if (names) results.set("backends", Array(names->begin(), names->end()));
+    pending->answer(std::move(results));
+  };
+}
+
+FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return
+      [pending = std::move(pending)](std::optional<std::string> text, std::optional<ReportingError> error) {
+        Dictionary results;
+        if (text) results.set("reply", std::move(*text));
+        setError(results, error);
+        pending->answer(std::move(results));
+      };
+}
+
+BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return [pending = std::move(pending)](bool uploaded) { pending->answer({{"uploaded", uploaded}}); };
+}
+
+UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return [pending = std::move(pending)](bool uploaded, std::optional<ReportingError> error) {
+    Dictionary results{{"uploaded", uploaded}};
+    setError(results, error);
+    pending->answer(std::move(results));
+  };
+}
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,38 @@
+// Events to one client. Any thread.
+#include "ipc/remote_object.h"
+
+#include <fmt/format.h>
+
+#include "ipc/frame.h"
+
+namespace veltrad::ipc {
+
+void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, double timestamp,
+                                       std::uint16_t category, std::uint16_t type,
+                                       std::optional<Dictionary> payload) {
+  Dictionary arguments{{"timestamp", timestamp}, {"category", unsigned{category}}, {"type", unsigned{type}}};
+  if (sessionInfo) arguments.set("sessionInfo", std::move(*sessionInfo));
+  if (payload) arguments.set("payload", std::move(*payload));
+  Dictionary body{{"op", "sendMessageToClient:timestamp:category:type:payload:"}};
+  body.set("args", std::move(arguments));
+  const std::string frame = makeFrame(FrameKind::event, 0, std::move(body));
+  const OutQueue::Sent sent = _out->sendEvent(frame);
+  if (sent == OutQueue::Sent::done || !_handler) return;
+  switch (sent) {
+    case OutQueue::Sent::full:
+      _handler(
+          fmt::format("The client does not read: more than {} bytes would wait for it.", kOutQueueBound));
+      return;
+    case OutQueue::Sent::tooLarge:
+      _handler(fmt::format("The event of {} bytes is larger than a frame may be ({} bytes).",
+                           frame.size() - kFrameHeaderBytes, kFrameBodyLimit));
+      return;
+    case OutQueue::Sent::gone:
+      _handler("The client has gone.");
+      return;
+    case OutQueue::Sent::done:
+      return;
+  }
+}
+
+}  // namespace veltrad::ipc

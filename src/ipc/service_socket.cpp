@@ -1,0 +1,133 @@
+// Lock, stale socket, bind, listen. One thread at a time.
+#include "ipc/service_socket.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/file.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+
+#include <cerrno>
+#include <cstring>
+
+namespace veltrad::ipc {
+
+namespace {
+
+using platform::FileDescriptor;
+
+constexpr int kWaitingConnections = 1024;
+
+std::string reason(int error) {
+  return std::strerror(error);
+}
+
+std::string holderOf(int lock) {
+  char text[32] = {};
+  const ssize_t count = ::pread(lock, text, sizeof text - 1, 0);
+  std::string_view number(text, count > 0 ? static_cast<std::size_t>(count) : 0);
+  number = number.substr(0, number.find_first_not_of("0123456789"));
+  return number.empty() ? "another process" : fmt::format("process {}", number);
+}
+
+Result<FileDescriptor, std::string> takeLock(const std::string& path) {
+  FileDescriptor lock(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
+  if (!lock.isOpen()) return Failure{fmt::format("The lock {} cannot be opened: {}.", path, reason(errno))};
+  if (::flock(lock.get(), LOCK_EX | LOCK_NB) != 0) {
+    if (errno != EWOULDBLOCK)
+      return Failure{fmt::format("The lock {} cannot be taken: {}.", path, reason(errno))};
+    return Failure{
+        fmt::format("The daemon is already running: {} holds {}. Stop it first, or give this one a root of "
+                    "its own in VELTRA_ROOT.",
+                    holderOf(lock.get()), path)};
+  }
+  // Who holds it is for people; the lock holds without it.
+  const std::string holder = fmt::format("{}\n", ::getpid());
+  if (::ftruncate(lock.get(), 0) == 0) {
+    [[maybe_unused]] const ssize_t written = ::pwrite(lock.get(), holder.data(), holder.size(), 0);
+  }
+  return lock;
+}
+
+int socketOption(int socket, int option) {
+  int value = -1;
+  socklen_t size = sizeof value;
+  return ::getsockopt(socket, SOL_SOCKET, option, &value, &size) == 0 ? value : -1;
+}
+
+// Absent: usable.
+std::optional<std::string> faultOfHandedOver(int socket) {
+  if (socketOption(socket, SO_DOMAIN) != AF_UNIX || socketOption(socket, SO_TYPE) != SOCK_STREAM) {
+    return fmt::format("The descriptor {} that was handed over is no Unix stream socket.", socket);
+  }
+  if (socketOption(socket, SO_ACCEPTCONN) != 1) {
+    return fmt::format("The socket {} that was handed over does not listen.", socket);
+  }
+  ::fcntl(socket, F_SETFD, FD_CLOEXEC);
+  return std::nullopt;
+}
+
+// Absent: nothing stands at the path any more. Only the holder of the lock calls it.
+std::optional<std::string> removeStale(const std::string& path) {
+  struct stat found {};
+  if (::lstat(path.c_str(), &found) != 0) {
+    if (errno == ENOENT) return std::nullopt;
+    return fmt::format("{} cannot be looked at: {}.", path, reason(errno));
+  }
+  if (!S_ISSOCK(found.st_mode)) {
+    return fmt::format("{} is no socket, but the daemon's socket belongs there: remove it.", path);
+  }
+  if (::unlink(path.c_str()) != 0 && errno != ENOENT) {
+    return fmt::format("The stale socket {} cannot be removed: {}.", path, reason(errno));
+  }
+  return std::nullopt;
+}
+
+Result<FileDescriptor, std::string> listenAt(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  if (path.size() >= sizeof address.sun_path) {
+    return Failure{fmt::format(
+        "The socket's path {} has {} bytes, and a socket address holds {}: choose a shorter root.", path,
+        path.size(), sizeof address.sun_path - 1)};
+  }
+  std::memcpy(address.sun_path, path.data(), path.size());
+  if (auto fault = removeStale(path)) return Failure{std::move(*fault)};
+  FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  if (!socket.isOpen()) return Failure{fmt::format("No socket could be made: {}.", reason(errno))};
+  if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    return Failure{fmt::format("The socket {} cannot be made: {}.", path, reason(errno))};
+  }
+  // The entitlement decides who may use it, not the file mode.
+  if (::chmod(path.c_str(), 0666) != 0 || ::listen(socket.get(), kWaitingConnections) != 0) {
+    const int error = errno;
+    ::unlink(path.c_str());
+    return Failure{fmt::format("The socket {} cannot be opened to clients: {}.", path, reason(error))};
+  }
+  return socket;
+}
+
+}  // namespace
+
+void ServiceSocket::close() {
+  if (!_listening.isOpen()) return;
+  if (!_madePath.empty()) ::unlink(_madePath.c_str());
+  _listening.reset();
+}
+
+Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
+                                                     std::optional<int> handedOver) {
+  FileDescriptor given(handedOver.value_or(-1));
+  if (handedOver) {
+    if (auto fault = faultOfHandedOver(*handedOver)) return Failure{std::move(*fault)};
+  }
+  auto lock = takeLock(root.lockPath());
+  if (!lock) return Failure{lock.error()};
+  if (handedOver) return ServiceSocket(std::move(given), std::move(lock.value()), {});
+  auto made = listenAt(root.socketPath());
+  if (!made) return Failure{made.error()};
+  return ServiceSocket(std::move(made.value()), std::move(lock.value()), root.socketPath());
+}
+
+}  // namespace veltrad::ipc

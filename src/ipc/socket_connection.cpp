@@ -1,0 +1,203 @@
+// The life of a connection; all of it but stop() on the connection's own thread.
+#include "ipc/socket_connection.h"
+
+#include <fmt/format.h>
+#include <poll.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "ipc/dispatcher.h"
+#include "ipc/remote_object.h"
+#include "platform/log.h"
+
+namespace veltrad::ipc {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// What waits for a client that has said its last word is written for so long, not longer.
+constexpr std::chrono::seconds kLastWrites{1};
+constexpr const char* kDaemonVersion = "8.0";
+
+std::string describe(std::uint64_t number, const platform::Peer& peer) {
+  return fmt::format("connection {} (uid {}, pid {})", number, peer.uid, peer.pid);
+}
+
+}  // namespace
+
+std::string refusalFrame(const std::string& description) {
+  return makeFrame(FrameKind::refusal, 0,
+                   {{"error", dictionaryOfError(makeReportingError(description, -1))}});
+}
+
+SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
+                                   platform::Entitlements& entitlements, platform::Counters& counters)
+    : _out(std::make_shared<OutQueue>(std::move(socket), counters)),
+      _peer(std::move(peer)),
+      _description(describe(number, _peer)),
+      _entitlements(entitlements),
+      _counters(counters) {}
+
+std::optional<Value> SocketConnection::valueForEntitlement(std::string_view name) {
+  return _entitlements.valueForEntitlement(name, _peer);
+}
+
+std::shared_ptr<ClientSessionReplyInterface> SocketConnection::remoteObjectProxyWithErrorHandler(
+    std::function<void(const std::string&)> handler) {
+  return std::make_shared<RemoteObject>(_out, std::move(handler));
+}
+
+void SocketConnection::run() {
+  // A delegate that accepted without resume() or without a session has nothing that could serve the client.
+  if (_resumed && _session) serve();
+  end();
+}
+
+void SocketConnection::refuse(const std::string& description) {
+  _session.reset();
+  _interruptionHandler = nullptr;
+  _invalidationHandler = nullptr;
+  _out->sendReply(refusalFrame(description));
+  _out->close();
+}
+
+void SocketConnection::stop(Clock::time_point deadline) {
+  _deadline.store(deadline.time_since_epoch().count(), std::memory_order_relaxed);
+  _stopping.store(true, std::memory_order_release);
+  _out->stopReading();
+}
+
+bool SocketConnection::overdue() const {
+  return _stopping.load(std::memory_order_acquire) &&
+         Clock::now().time_since_epoch().count() >= _deadline.load(std::memory_order_relaxed);
+}
+
+void SocketConnection::serve() {
+  while (runFrames() && !_ended) {
+    if (!receive()) return;
+  }
+}
+
+// Every whole frame that is there, unless the client must first read what waits for it. False: the end.
+bool SocketConnection::runFrames() {
+  Frame frame;
+  while (!_out->endRequested() && !overdue()) {
+    if (_out->waitingBytes() > kOutQueueHighWater && !_stopping.load(std::memory_order_acquire)) {
+      wait();
+      continue;
+    }
+    switch (_reader.next(frame)) {
+      case FrameReader::Next::frame:
+        if (!runFrame(frame)) return false;
+        break;
+      case FrameReader::Next::impossible:
+        return violation(
+            fmt::format("A frame of {} bytes with {} descriptors is impossible: at most {} and 1.",
+                        frame.header.bodyLength, frame.header.descriptors, frame.header.bodyLimit()));
+      case FrameReader::Next::needMore:
+        if (_reader.strayDescriptors()) return violation("A descriptor came that no frame announced.");
+        return true;
+    }
+  }
+  return false;
+}
+
+// Some more bytes, or the end of them. False: the end of all.
+bool SocketConnection::receive() {
+  while (true) {
+    if (_reader.moreLikely()) {
+      _out->flush();
+    } else {
+      wait();
+    }
+    if (_out->endRequested() || overdue()) return false;
+    switch (_reader.receive(_out->socket())) {
+      case SocketReader::Got::bytes:
+        return true;
+      case SocketReader::Got::nothing:
+        break;
+      case SocketReader::Got::end:
+        _ended = true;
+        return true;
+      case SocketReader::Got::badDescriptors:
+        return violation("More descriptors came than a frame can carry.");
+    }
+  }
+}
+
+// Until the client has sent something or takes something, or somebody woke us. While too much waits for the
+// client, only the latter two count.
+void SocketConnection::wait() {
+  const std::size_t waiting = _out->flush();
+  short events = waiting > 0 ? POLLOUT : 0;
+  if (waiting <= kOutQueueHighWater) events |= POLLIN;
+  pollfd watched[] = {{_out->socket(), events, 0}, {_out->wakeUp(), POLLIN, 0}};
+  if (::poll(watched, 2, -1) > 0 && watched[1].revents != 0) _out->drainWakeUp();
+}
+
+bool SocketConnection::runFrame(const Frame& frame) {
+  platform::FileDescriptor lent;
+  if (frame.header.descriptors == 1) {
+    auto came = _reader.takeDescriptor();
+    if (!came) return violation("A frame announced a descriptor, and none came.");
+    lent = std::move(*came);
+  }
+  if (!_greeted) return greet(frame);
+  if (const auto why = dispatchCall(frame, *_session, _out)) interrupted(*why);
+  return true;
+}
+
+bool SocketConnection::greet(const Frame& frame) {
+  if (frame.header.kind != FrameKind::hello) {
+    return violation(fmt::format("The first frame must be a hello (kind 1), not of kind {}.",
+                                 static_cast<unsigned>(frame.header.kind)));
+  }
+  const auto body = decodeFrameBody(frame);
+  if (!body) return violation(fmt::format("The hello cannot be read: {}.", body.error()));
+  const Value* stated = body.value().find("wire");
+  const auto wire = stated ? stated->toInt64() : std::nullopt;
+  if (!wire) return violation("The hello cannot be read: \"wire\" must be a number.");
+  if (*wire != kWireVersion) {
+    return violation(
+        fmt::format("The client speaks wire version {}, the daemon speaks version {}.", *wire, kWireVersion));
+  }
+  _greeted = true;
+  _out->sendReply(makeFrame(FrameKind::hello, 0, {{"wire", kWireVersion}, {"daemon", kDaemonVersion}}));
+  return true;
+}
+
+void SocketConnection::interrupted(const std::string& why) {
+  _counters.count("call refused: it cannot be read");
+  logDebug("connection: %s sent a call that cannot be read: %s", _description.c_str(), why.c_str());
+  if (_interruptionHandler) _interruptionHandler();
+}
+
+// The client broke the protocol: it is told how, and the connection ends.
+bool SocketConnection::violation(const std::string& description) {
+  _counters.count("connection ended: the client broke the protocol");
+  logDebug("connection: %s ends: %s", _description.c_str(), description.c_str());
+  _out->sendReply(refusalFrame(description));
+  return false;
+}
+
+void SocketConnection::end() {
+  if (const auto handler = std::exchange(_invalidationHandler, nullptr)) handler();
+  _interruptionHandler = nullptr;
+  if (const auto session = std::exchange(_session, nullptr)) session->end();
+  writeRest();
+  _out->close();
+}
+
+void SocketConnection::writeRest() {
+  const auto last = Clock::now() + kLastWrites;
+  while (_out->flush() > 0 && !_out->endRequested() && !overdue()) {
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(last - Clock::now()).count();
+    if (left <= 0) return;
+    pollfd watched{_out->socket(), POLLOUT, 0};
+    ::poll(&watched, 1, static_cast<int>(std::min<long>(left, 100)));
+  }
+}
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,93 @@
+// One client's connection over a Unix socket.
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <string>
+
+#include "ipc/out_queue.h"
+#include "ipc/socket_reader.h"
+#include "platform/counters.h"
+#include "platform/entitlements.h"
+#include "platform/peer.h"
+#include "protocol/connection.h"
+
+namespace veltrad::ipc {
+
+// Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
+// the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
+// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements and counters outlive it.
+// A session and its connection hold each other until run() returns.
+class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
+ public:
+  SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
+                   platform::Entitlements& entitlements, platform::Counters& counters);
+
+  // False: the system had no wake-up descriptor for it.
+  bool usable() const { return _out->usable(); }
+  const platform::Peer& peer() const { return _peer; }
+
+  // The whole life after the delegate said yes: frames until the end, then the invalidation handler, the
+  // session's end(), and the socket closed.
+  void run();
+  // The whole life after the delegate said no: the client is told why, and the socket closed.
+  void refuse(const std::string& description);
+  // The client's bytes end here: frames that came whole are run, up to `deadline`; then the connection ends.
+  void stop(std::chrono::steady_clock::time_point deadline);
+
+  std::string description() const override { return _description; }
+  std::optional<Value> valueForEntitlement(std::string_view name) override;
+  void setExportedObject(std::shared_ptr<ClientSessionInterface> session) override {
+    _session = std::move(session);
+  }
+  void setInterruptionHandler(std::function<void()> handler) override {
+    _interruptionHandler = std::move(handler);
+  }
+  void setInvalidationHandler(std::function<void()> handler) override {
+    _invalidationHandler = std::move(handler);
+  }
+  void resume() override { _resumed = true; }
+  std::shared_ptr<ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
+      std::function<void(const std::string&)> handler) override;
+
+ private:
+  void serve();
+  bool runFrames();
+  bool runFrame(const Frame& frame);
+  bool greet(const Frame& frame);
+  bool receive();
+  void wait();
+  void interrupted(const std::string& why);
+  bool violation(const std::string& description);
+  void end();
+  void writeRest();
+  bool overdue() const;
+
+  // Constant after construction.
+  const std::shared_ptr<OutQueue> _out;
+  const platform::Peer _peer;
+  const std::string _description;
+  platform::Entitlements& _entitlements;
+  platform::Counters& _counters;
+
+  // Own thread only.
+  SocketReader _reader;
+  std::shared_ptr<ClientSessionInterface> _session;
+  std::function<void()> _interruptionHandler;
+  std::function<void()> _invalidationHandler;
+  bool _resumed = false;
+  bool _greeted = false;
+  bool _ended = false;  // the client's bytes have ended
+
+  // Any thread.
+  std::atomic<bool> _stopping{false};
+  std::atomic<std::chrono::steady_clock::rep> _deadline{
+      std::chrono::steady_clock::time_point::max().time_since_epoch().count()};
+};
+
+// A refusal's frame; for sockets that get no connection at all, too.
+std::string refusalFrame(const std::string& description);
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,71 @@
+// recvmsg, and nothing else that reads. The connection's own thread.
+#include "ipc/socket_reader.h"
+
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+
+namespace veltrad::ipc {
+
+namespace {
+
+constexpr std::size_t kLeastRoom = 4096;
+constexpr std::size_t kMostRoom = 64u << 10;
+constexpr std::size_t kDescriptorsAtOnce = 4;
+// A client may send several frames with one descriptor each in a single message.
+constexpr std::size_t kMostDescriptors = 16;
+
+// False: more came than there was room for.
+bool takeControl(msghdr& message, std::deque<platform::FileDescriptor>& into) {
+  for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
+    if (part->cmsg_level != SOL_SOCKET || part->cmsg_type != SCM_RIGHTS) continue;
+    const std::size_t count = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
+    for (std::size_t i = 0; i < count; ++i) {
+      int number = -1;
+      std::memcpy(&number, CMSG_DATA(part) + i * sizeof number, sizeof number);
+      into.emplace_back(number);
+    }
+  }
+  return (message.msg_flags & MSG_CTRUNC) == 0 && into.size() <= kMostDescriptors;
+}
+
+}  // namespace
+
+SocketReader::Got SocketReader::receive(int socket) {
+  const auto [place, size] = _frames.room(std::max(_wanted, kLeastRoom));
+  iovec bytes{place, size};
+  alignas(cmsghdr) char control[CMSG_SPACE(kDescriptorsAtOnce * sizeof(int))];
+  msghdr message{};
+  message.msg_iov = &bytes;
+  message.msg_iovlen = 1;
+  message.msg_control = control;
+  message.msg_controllen = sizeof control;
+  ssize_t count;
+  do {
+    count = ::recvmsg(socket, &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+  } while (count < 0 && errno == EINTR);
+  if (count < 0) {
+    _moreLikely = false;
+    return errno == EAGAIN || errno == EWOULDBLOCK ? Got::nothing : Got::end;
+  }
+  const bool fits = takeControl(message, _descriptors);
+  if (!fits) return Got::badDescriptors;
+  if (count == 0) return Got::end;
+  const auto came = static_cast<std::size_t>(count);
+  _frames.received(came);
+  // A message with descriptors ends a read early, a full buffer late.
+  _moreLikely = came == size || message.msg_controllen > 0;
+  _wanted = came == size ? kMostRoom : kLeastRoom;
+  return Got::bytes;
+}
+
+std::optional<platform::FileDescriptor> SocketReader::takeDescriptor() {
+  if (_descriptors.empty()) return std::nullopt;
+  platform::FileDescriptor first = std::move(_descriptors.front());
+  _descriptors.pop_front();
+  return first;
+}
+
+}  // namespace veltrad::ipc
