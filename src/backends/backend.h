@@ -141,7 +141,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<bool> _batchEvents{false};
 
-  mutable Mutex _propertyMutex{LockRank::backend};
+  mutable Mutex _propertyMutex BACKEND_LOCK{LockRank::backend};
   SharedDictionary _userInfoDict GUARDED_BY(_propertyMutex);
   std::optional<std::string> _combinedSessionIDString GUARDED_BY(_propertyMutex);
   std::optional<std::string> _displayURL GUARDED_BY(_propertyMutex);

@@ -37,6 +37,29 @@ enum class LockRank : int {
   leaf = 100,
 };
 
+// The same order for the compiler: each level stands between two ranks, and a lock of a rank says on which
+// side of them it lies. Clang's -Wthread-safety-beta then refuses a function that takes two locks in the
+// wrong order.
+namespace lock_order {
+class CAPABILITY("lock level") Level {};
+inline Level belowSessionList;
+inline Level belowAgent ACQUIRED_AFTER(belowSessionList);
+inline Level belowFlushCounters ACQUIRED_AFTER(belowAgent);
+inline Level belowSession ACQUIRED_AFTER(belowFlushCounters);
+inline Level belowBackend ACQUIRED_AFTER(belowSession);
+}  // namespace lock_order
+#define SESSION_LIST_LOCK ACQUIRED_BEFORE(::veltrad::lock_order::belowSessionList)
+#define AGENT_LOCK \
+  ACQUIRED_AFTER(::veltrad::lock_order::belowSessionList) ACQUIRED_BEFORE(::veltrad::lock_order::belowAgent)
+#define FLUSH_COUNTERS_LOCK \
+  ACQUIRED_AFTER(::veltrad::lock_order::belowAgent) ACQUIRED_BEFORE(::veltrad::lock_order::belowFlushCounters)
+#define SESSION_LOCK                                        \
+  ACQUIRED_AFTER(::veltrad::lock_order::belowFlushCounters) \
+  ACQUIRED_BEFORE(::veltrad::lock_order::belowSession)
+#define BACKEND_LOCK \
+  ACQUIRED_AFTER(::veltrad::lock_order::belowSession) ACQUIRED_BEFORE(::veltrad::lock_order::belowBackend)
+#define LEAF_LOCK ACQUIRED_AFTER(::veltrad::lock_order::belowBackend)
+
 namespace lock_order {
 // Debug builds: aborts with both ranks when `rank` may not be taken now. Release builds: nothing.
 void taking(LockRank rank, bool recursive);

@@ -48,10 +48,10 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
   platform::Transaction& _transaction;
 
   // Also covers opening and closing the transaction.
-  RecursiveMutex _sessionListLock{LockRank::sessionList};
+  RecursiveMutex _sessionListLock SESSION_LIST_LOCK{LockRank::sessionList};
   std::vector<std::shared_ptr<VeltradSession>> _sessionList GUARDED_BY(_sessionListLock);
 
-  RecursiveMutex _lock{LockRank::agent};
+  RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
   StorebagCache _cachedStorebags GUARDED_BY(_lock);
   // Lists stay when they become empty. A session is in at most one: that of the key it is remembered under.
   std::map<std::string, std::vector<std::shared_ptr<VeltradSession>>> _correlatedSessions GUARDED_BY(_lock);

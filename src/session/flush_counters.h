@@ -27,7 +27,7 @@ class FlushCounters {
                 const std::optional<ReportingError>& error);
 
  private:
-  Mutex _mutex{LockRank::flushCounters};
+  Mutex _mutex FLUSH_COUNTERS_LOCK{LockRank::flushCounters};
 };
 
 }  // namespace veltrad

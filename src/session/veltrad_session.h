@@ -124,7 +124,7 @@ class VeltradSession final : public ClientSessionInterface,
   std::atomic<std::uint32_t> _sessionID{0};
   std::atomic<bool> _hasAggregator{false};
 
-  mutable Mutex _mutex{LockRank::session};
+  mutable Mutex _mutex SESSION_LOCK{LockRank::session};
   SharedDictionary _sessionInfo GUARDED_BY(_mutex);
   SharedDictionary _userInfo GUARDED_BY(_mutex);
   std::shared_ptr<const BackendSet> _backends GUARDED_BY(_mutex);

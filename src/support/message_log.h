@@ -42,7 +42,7 @@ class MessageLogFile final : public MessageLog {
   const platform::Clock& _clock;
   const std::string _directory;
 
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
 };
 
 // "%@" by "%@". Exposed for its table of tests.

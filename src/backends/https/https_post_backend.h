@@ -73,7 +73,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::optional<double> _overrideSampling;
   std::optional<std::string> _uuidCustom;
 
-  Mutex _batchMutex{LockRank::backend};
+  Mutex _batchMutex BACKEND_LOCK{LockRank::backend};
   EventBatch _batch GUARDED_BY(_batchMutex);
 };
 

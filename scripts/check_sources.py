@@ -1,0 +1,93 @@
+"""Format, include ladder, file that must not compile, clang-tidy. Says what is wrong and where; status 1 when anything is."""
+import re
+import subprocess
+import sys
+from pathlib import Path
+
+ROOT = Path(__file__).resolve().parent.parent
+# Each room may include itself and the rooms that it lists; the ladder of docs/architecture.md.
+LADDER = ["base", "platform", "protocol", "ipc", "support", "config", "backends", "session", "daemon", "tools"]
+BELOW = {room: set(LADDER[:index]) for index, room in enumerate(LADDER)}
+BELOW["client"] = {"base", "platform", "protocol", "ipc"}
+BELOW["tools"] = {"base", "platform", "protocol", "support", "config", "client"}
+BELOW["support"] = {"base", "platform", "protocol"}
+# Backend kinds know nothing of each other.
+KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
+LONGEST_BODY = 400
+LONGEST_HEADER = 300
+
+
+def sources(*suffixes):
+    for folder in ("src", "include", "tests", "bench", "examples"):
+        for path in sorted((ROOT / folder).rglob("*")):
+            if path.suffix in suffixes:
+                yield path
+
+
+def check_format():
+    files = [str(path) for path in sources(".cpp", ".h", ".hpp", ".c")]
+    done = subprocess.run(["clang-format", "--dry-run", "-Werror", *files], capture_output=True, text=True)
+    return sorted({line.split(":")[0] + ": not formatted; run clang-format -i on it"
+                   for line in done.stderr.splitlines() if "error:" in line})
+
+
+def check_ladder():
+    found = []
+    for path in sources(".cpp", ".h"):
+        parts = path.relative_to(ROOT).parts
+        if parts[0] != "src":
+            continue
+        room = parts[1]
+        for number, line in enumerate(path.read_text().splitlines(), 1):
+            match = re.match(r'#include "([a-z_]+)/([a-z_/]*)', line)
+            if not match:
+                continue
+            target = match[1]
+            place = f"{path.relative_to(ROOT)}:{number}"
+            if target in BELOW and target != room and target not in BELOW.get(room, set()):
+                found.append(f"{place}: {room} includes {target}, which is not below it")
+            kind = parts[2] if room == "backends" and len(parts) > 3 else None
+            if kind in KINDS and target == "backends" and match[2].split("/")[0] in set(KINDS) - {kind}:
+                found.append(f"{place}: one kind of backend includes another")
+    return found
+
+
+def check_size():
+    found = []
+    for path in sources(".cpp", ".h", ".hpp"):
+        lines = len(path.read_text().splitlines())
+        bound = LONGEST_BODY if path.suffix == ".cpp" else LONGEST_HEADER
+        if "tests" not in path.parts and lines > bound:
+            found.append(f"{path.relative_to(ROOT)}: {lines} lines, more than {bound}; look for the second class in it")
+    return found
+
+
+def check_must_not_compile():
+    done = subprocess.run([sys.executable, "tests/must_not_compile/run.py"], cwd=ROOT, capture_output=True, text=True)
+    return [] if done.returncode == 0 else done.stdout.splitlines()
+
+
+def check_lint():
+    subprocess.run(["cmake", "--preset", "dev"], cwd=ROOT, check=True, capture_output=True)
+    files = [str(path) for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"]
+    done = subprocess.run(["run-clang-tidy", "-quiet", "-p", "build/dev", *files], cwd=ROOT, capture_output=True,
+                          text=True)
+    return [line for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
+
+
+def main():
+    checks = {"format": check_format, "include ladder": check_ladder, "size": check_size,
+              "must not compile": check_must_not_compile, "lint": check_lint}
+    if "--no-lint" in sys.argv[1:]:
+        del checks["lint"]
+    failed = False
+    for name, check in checks.items():
+        found = check()
+        failed |= bool(found)
+        print(f"{name}: " + ("as it should be" if not found else f"{len(found)} found"))
+        for line in found:
+            print("  " + line)
+    sys.exit(1 if failed else 0)
+
+
+main()

@@ -1,0 +1,35 @@
+"""Compiles each file as it is, which must work, and with its fault, which must fail for the reason given."""
+import subprocess
+import sys
+from pathlib import Path
+
+HERE = Path(__file__).resolve().parent
+SOURCES = HERE.parent.parent / "src"
+ROOMS = HERE.parent.parent / "build" / "dev" / "rooms"
+LOCKS = ["-I", str(SOURCES), "-Wthread-safety", "-Wthread-safety-beta", "-Werror"]
+CONFIG = [word for room in ("config", "support", "protocol", "platform", "base") for word in ("-I", str(ROOMS / room))]
+# Each: the file, what it is compiled with, and what must stand in the error; None: it must compile.
+CASES = [
+    ("lock_order.cpp", LOCKS, None),
+    ("lock_order.cpp", [*LOCKS, "-DWRONG_ORDER=1"], "must be acquired before"),
+    ("lock_order.cpp", [*LOCKS, "-DWRONG_ORDER=2"], "must be acquired before"),
+    ("include_ladder.cpp", CONFIG, None),
+    ("include_ladder.cpp", [*CONFIG, "-DUPWARD"], "'session/veltrad_session.h' file not found"),
+]
+
+
+def main():
+    failed = 0
+    for name, flags, expected in CASES:
+        command = ["clang++", "-std=c++20", "-fsyntax-only", *flags, str(HERE / name)]
+        done = subprocess.run(command, capture_output=True, text=True)
+        good = done.returncode == 0 if expected is None else done.returncode != 0 and expected in done.stderr
+        if not good:
+            failed += 1
+            wanted = "does not compile" if expected is None else f"was not refused with \"{expected}\""
+            print(f"{name} {[flag for flag in flags if flag.startswith('-D')]}: {wanted}\n{done.stderr}")
+    print(f"{len(CASES) - failed} passed, {failed} failed")
+    sys.exit(1 if failed else 0)
+
+
+main()
