@@ -46,10 +46,6 @@ void Connections::cut(const SSL* connection) {
   ::shutdown(SSL_get_fd(connection), SHUT_RDWR);
 }
 
-void Connections::endAfterAnswer(const SSL* connection) {
-  ::shutdown(SSL_get_fd(connection), SHUT_RD);
-}
-
 void Connections::stop() {
   const Lock hold(_mutex);
   _stopped = true;

@@ -17,8 +17,6 @@ class Connections {
   void watch(SSL_CTX& context);
   // Ends the connection: no byte more goes out.
   static void cut(const SSL* connection);
-  // The connection reads nothing more, so it ends after its answer.
-  static void endAfterAnswer(const SSL* connection);
   // Ends every connection, those that come later included.
   void stop();
 

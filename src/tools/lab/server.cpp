@@ -62,6 +62,17 @@ void refuse(httplib::Response& response, int status, const std::string& why) {
   response.set_content(why + "\n", kPlainText);
 }
 
+// Ends the connection after `sent` bytes of the body: the library closes it when a provider fails.
+void sendAndEnd(httplib::Response& response, const std::string& body, std::size_t sent,
+                const std::string& type) {
+  response.set_content_provider(
+      std::max<std::size_t>(body.size(), 1), type,
+      [part = body.substr(0, sent)](std::size_t, std::size_t, httplib::DataSink& sink) {
+        sink.write(part.data(), part.size());
+        return false;
+      });
+}
+
 }  // namespace
 
 struct Server::Library {
@@ -146,10 +157,12 @@ void Server::Library::collect(const httplib::Request& request, httplib::Response
     return true;
   });
   if (!whole) {
-    Connections::endAfterAnswer(request.ssl);
+    // What is left of it would be read as the next request.
     const bool tooLarge = response.status == 413 || body.size() + kPieceBytes > kMostBodyBytes;
-    return refuse(response, tooLarge ? 413 : 400,
-                  tooLarge ? "a body has at most 64 MiB" : "the body is cut short or is no gzip");
+    const std::string why =
+        tooLarge ? "a body has at most 64 MiB\n" : "the body is cut short or is no gzip\n";
+    response.status = tooLarge ? 413 : 400;
+    return sendAndEnd(response, why, why.size(), kPlainText);
   }
   if (request.path == "/control") return control(request, response, body);
   const auto rule = lab._misbehaviour.take(request.path);
@@ -201,16 +214,7 @@ void Server::Library::send(const httplib::Request& request, httplib::Response& r
     return Connections::cut(request.ssl);
   for (const auto& [name, text] : answer.headers) response.set_header(name, text.toText().value_or(""));
   if (rule && rule->endless) return sendEndless(response, answer.type);
-  if (rule && rule->cutHalfway) {
-    response.set_content_provider(
-        std::max<std::size_t>(answer.body.size(), 2), answer.type,
-        [body = answer.body](std::size_t, std::size_t most, httplib::DataSink& sink) {
-          const std::string half = body.substr(0, most / 2);
-          sink.write(half.data(), half.size());
-          return false;
-        });
-    return;
-  }
+  if (rule && rule->cutHalfway) return sendAndEnd(response, answer.body, answer.body.size() / 2, answer.type);
   if (!answer.body.empty()) response.set_content(answer.body, answer.type);
 }
 

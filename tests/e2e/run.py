@@ -1,0 +1,62 @@
+#!/usr/bin/env python3
+"""Runs the tests with real processes: all of them, or those named (test_road, test_road.ThinRoad.test_batch).
+VELTRA_BUILD is the build directory, build/dev by default. The last line is "N passed, N failed"; status 1 when any
+failed. One process for each class, two at a time."""
+import concurrent.futures
+import os
+import pathlib
+import subprocess
+import sys
+import time
+import unittest
+
+HERE = pathlib.Path(__file__).resolve().parent
+sys.path.insert(0, str(HERE))
+
+
+def leaves(suite):
+    for item in suite:
+        yield from leaves(item) if isinstance(item, unittest.TestSuite) else [item]
+
+
+def run_here(names):
+    import harness
+    result = unittest.TextTestRunner(verbosity=2).run(unittest.defaultTestLoader.loadTestsFromNames(names))
+    harness.Lab.forget_keys()
+    failed = {str(test) for test, _ in result.failures + result.errors} | set(map(str, result.unexpectedSuccesses))
+    print(f"RESULT {result.testsRun - len(failed)} {len(failed)}")
+
+
+def run_apart(names):
+    begin = time.monotonic()
+    done = subprocess.run([sys.executable, __file__, "--here", *names], stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+    *lines, last = done.stdout.decode("utf-8", "replace").rstrip("\n").split("\n")
+    if last.startswith("RESULT "):
+        passed, failed = map(int, last.split()[1:])
+    else:
+        lines, passed, failed = lines + [last], 0, len(names)
+    return names[0].rsplit(".", 1)[0], passed, failed, time.monotonic() - begin, "\n".join(lines)
+
+
+def main(names):
+    names = names or sorted(path.stem for path in HERE.glob("test_*.py"))
+    classes = {}
+    for test in leaves(unittest.defaultTestLoader.loadTestsFromNames(names)):
+        classes.setdefault(type(test), []).append(test.id())
+    total_passed = total_failed = 0
+    with concurrent.futures.ThreadPoolExecutor(min(2, os.cpu_count() or 1)) as pool:
+        for done in concurrent.futures.as_completed([pool.submit(run_apart, ids) for ids in classes.values()]):
+            name, passed, failed, seconds, output = done.result()
+            total_passed, total_failed = total_passed + passed, total_failed + failed
+            print(f"{name}: {passed} passed, {failed} failed, {seconds:.1f} s", flush=True)
+            if failed:
+                print(output, flush=True)
+    print(f"{total_passed} passed, {total_failed} failed")
+    return 1 if total_failed or not total_passed else 0
+
+
+if __name__ == "__main__":
+    if sys.argv[1:2] == ["--here"]:
+        run_here(sys.argv[2:])
+    else:
+        sys.exit(main(sys.argv[1:]))

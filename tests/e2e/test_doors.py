@@ -1,0 +1,179 @@
+"""Who gets in, and how the daemon comes and goes."""
+import os
+import re
+import signal
+import socket
+import subprocess
+import sys
+import time
+
+from harness import (DEADLINE, ENTITLEMENT, SERVING, Daemon, Root, SystemTest, Wire, program, wait_until)
+
+
+class Doors(SystemTest):
+    def test_entitlement(self):
+        own = {"uid": os.getuid(), "entitlements": {ENTITLEMENT: True}}
+        refused = [[{**own, "uid": os.getuid() + 1}], [{**own, "entitlements": {ENTITLEMENT: 1}}],
+                   [{**own, "entitlements": {ENTITLEMENT: "true"}}], [{"entitlements": {ENTITLEMENT: True}}], []]
+        with self.serving("Entitlements") as daemon:
+            for count, rules in enumerate(refused + [None, b"<plist"], 1):
+                with self.subTest(rules=rules):
+                    self.root.grant(rules) if isinstance(rules, list) else self.root.write(
+                        "etc/veltrad/entitlements.plist", rules or b"")
+                    kind, call, body = Wire(self.root, hello=False).frame()
+                    self.assertEqual((kind, call, body["error"]["domain"]), (Wire.REFUSAL, 0, "com.florn.veltra.error"))
+                    line = daemon.wait_for_line("does not have required", count)
+                    self.assertRegex(line, r"^<7>listener: new Vopex connection \S.* does not have required veltra "
+                                           r"entitlement\. Closing connection\.\.\.$")
+            _, said = self.ctl("session", "--client-type", "7", status=1)
+            self.assertIn(ENTITLEMENT, said)
+            self.assertIn("entitlements.plist", said)
+            self.root.grant([{"gid": os.getgid(), "entitlements": {ENTITLEMENT: True}}])  # takes effect at once
+            self.assertEqual(self.open()[1], ["httppost"])
+
+    def test_lines_of_a_connection(self):
+        with self.serving() as daemon:
+            first, second = Wire(self.root), Wire(self.root)
+            accepted = daemon.wait_for_line("listener: Accepting new Vopex connection", 2)
+            lines = [line for line in daemon.text if "listener: Accepting" in line]
+            self.assertEqual(lines[1], accepted)
+            for line, count in zip(lines, (0, 1)):
+                self.assertRegex(line, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper entitlement, "
+                                       rf"{count}\(0\) connections\.$")
+            first.send(Wire.CALL, b"no property list", call=7)
+            kind, call, body = first.frame()
+            self.assertEqual((kind, call), (Wire.REPLY, 7))
+            self.assertTrue(body["error"]["description"])
+            interrupted = daemon.wait_for_line("was interrupted")
+            self.assertRegex(interrupted, r"^<7>listener: Vopex connection to \S.* was interrupted$")
+            self.assertEqual(first.call("fetchDisplayURL:")["results"]["reply"], "URL not available")
+            first.close()
+            invalidated = daemon.wait_for_line("was invalidated")
+            self.assertEqual(invalidated, interrupted.replace("interrupted", "invalidated"))
+            second.close()
+            daemon.wait_for_line("was invalidated", 2)
+            daemon.wait_for_line("<7>dealloc: VeltradSession dealloc: 0", 2)
+
+    def test_no_daemon(self):
+        nowhere, empty = Root(), Root()
+        self.addCleanup(empty.remove)
+        nowhere.remove()
+        for root in (nowhere, empty):
+            _, said = self.ctl("session", "--client-type", "7", status=1, root=root)
+            self.assertIn(root.socket, said)
+            self.assertEqual(said.count("\n"), 1, said)
+
+    def refused(self, root, words, **options):
+        """A daemon that does not start: status 1 and one error line with the words."""
+        daemon = Daemon(root, serving=False, **options)
+        self.addCleanup(daemon.kill)
+        self.assertEqual(daemon.end(), 1, daemon.text)
+        errors = [line for line in daemon.text if line.startswith("<3>")]
+        self.assertEqual(len(errors), 1, daemon.text)
+        self.assertIn(words, errors[0])
+
+    def test_second_daemon_stale_and_foreign_files(self):
+        with self.serving():
+            self.refused(self.root, str(self.root.path / "run/veltrad"))
+            self.assertEqual(self.open()[1], ["httppost"])
+        killed = self.daemon()
+        killed.kill()
+        self.assertTrue(os.path.exists(self.root.socket))
+        with self.serving():  # takes the stale socket's place
+            self.assertEqual(self.open()[1], ["httppost"])
+        self.assertFalse(os.path.exists(self.root.socket))
+        with open(self.root.socket, "w") as foreign:
+            foreign.write("mine")
+        self.refused(self.root, self.root.socket)
+        with open(self.root.socket) as foreign:
+            self.assertEqual(foreign.read(), "mine")
+
+    def test_root_that_does_not_fit(self):
+        self.root.path = self.root.path / ("deep" * 25)
+        self.root.path.mkdir()
+        self.refused(self.root, "deepdeep")
+        self.root.path = self.root.path.parent
+
+    def test_socket_activation_and_service_manager(self):
+        """Descriptor 3 is the listener; the service manager hears of readiness, of the transaction and of the end."""
+        os.makedirs(os.path.dirname(self.root.socket))
+        notify = str(self.root.path / "notify")
+        wrapper = ("import os, sys; os.dup2(int(sys.argv[1]), 3); os.environ.update(LISTEN_FDS='1', "
+                   "LISTEN_PID=str(os.getpid())); os.execv(sys.argv[2], sys.argv[2:])")
+        with socket.socket(socket.AF_UNIX) as listener, socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager:
+            manager.bind(notify)
+            manager.settimeout(DEADLINE)
+            told = ""
+
+            def hears(word):
+                nonlocal told
+                while word not in told:
+                    told += manager.recv(4096).decode() + "\n"
+            listener.bind(self.root.socket)
+            listener.listen(5)
+            waiting = Wire.__new__(Wire)  # connects before the daemon is there
+            with self.serving(wrapper=(sys.executable, "-c", wrapper, str(listener.fileno())),
+                              pass_fds=(listener.fileno(),), env={"NOTIFY_SOCKET": notify}):
+                hears("READY=1")
+                Wire.__init__(waiting, self.root)
+                hears("STATUS=")
+                self.assertEqual(self.open()[1], ["httppost"])
+                waiting.close()
+            hears("STOPPING=1")
+            self.assertTrue(os.path.exists(self.root.socket))
+
+
+class Stop(SystemTest):
+    def test_open_sessions_are_ended_and_reported(self):
+        daemon = self.daemon()
+        for number in range(3):
+            session, _ = self.open(7, "--batch-events", session_id=number)
+            session.send(number=number)
+        self.assertLess(daemon.stop(), 10)
+        events = self.lab.events()
+        self.assertEqual(sorted(e["number"] for e in events if "number" in e), [0, 1, 2])
+        self.assertEqual(len([e for e in events if (e["_method"], e["_status"]) == (0, 1)]), 3)
+        self.assertFalse(os.path.exists(self.root.socket))
+
+    def test_killed_client_costs_only_its_own_session(self):
+        with self.serving() as daemon:
+            victim, _ = self.open(7, session_id=1)
+            other, _ = self.open(7, session_id=2)
+            victim.popen.send_signal(signal.SIGKILL)
+            daemon.wait_for_line("<7>dealloc: VeltradSession dealloc: 1")
+            self.lab.wait_for_events(1, _method=0, _status=1)
+            other.send(after=True)
+            self.lab.wait_for_events(1, after=True)
+            self.assertNotIn("<7>dealloc: VeltradSession dealloc: 2", daemon.text)
+
+    def test_two_signals_end_it_at_once(self):
+        self.lab.control(path="/events", stall=True)
+        daemon = self.daemon()
+        self.open()
+        self.lab.received("events", 1)
+        daemon.popen.send_signal(signal.SIGTERM)
+        wait_until(lambda: not os.path.exists(self.root.socket), "the listener's end")
+        self.assertLess(daemon.stop(status=1), 2)
+
+
+class SilentCollector(SystemTest):
+    def test_end_within_ten_seconds(self):
+        self.lab.control(path="/events", stall=True)
+        daemon = self.daemon()
+        session, _ = self.open()
+        session.send()
+        self.lab.received("events", 2)
+        daemon.allow("HTTPSPostBackend(postJsonMessage): post error: ")
+        daemon.stop()
+
+
+class StopDuringDownload(SystemTest):
+    def test_download_is_given_up(self):
+        self.lab.control(path="/storebags", stall=True)
+        daemon = self.daemon()
+        client = Wire(self.root)
+        client.describe(6)
+        client.send(Wire.CALL, {"op": "startConfigWithCompletionHandler:", "args": {}}, call=99)
+        self.lab.storebags(1)
+        daemon.allow("Unable to fetch storebag", "Could not fetch storebag")
+        self.assertLess(daemon.stop(), 5)

@@ -1,0 +1,158 @@
+"""From a client's message to the collector."""
+import json
+import subprocess
+import time
+
+from harness import BUILD, SOURCE, SystemTest, program, storebag, wait_until
+
+
+class Road(SystemTest):
+    def test_event_with_its_headers_and_fields(self):
+        with self.serving() as daemon:
+            session, backends = self.open()
+            self.assertEqual(backends, ["httppost"])
+            reply = session.send(codec="opus", seconds=12.5, tags=3)["reply"]
+            self.assertEqual(json.loads(reply)["events"][0]["codec"], "opus")
+            self.lab.received("events", 2)
+            self.assertEqual(session.close(), 0)
+            start, event, stop = self.lab.wait_for_events(3)
+            self.assertEqual(daemon.unexpected(), [])
+        self.assertEqual((start["_method"], start["_status"], start["AutomaticTimeSet"], start["Locale"]),
+                         (0, 0, True, "US"))
+        self.assertEqual((stop["_method"], stop["_status"], stop["StorebagVersion"], stop["Opt"]), (0, 1, "v1", 0))
+        expected = {"codec": "opus", "seconds": 12.5, "tags": 3, "_sender": "JY", "_clientVersion": 3,
+                    "_eventNumber": 2, "_method": 5, "_status": 1, "_productFamily": "Elm", "_productModel": "Elm4,2",
+                    "_osVersion": "12.1", "_build": "21B74", "_internal": 3, "_reportVers": "8.0",
+                    "_timezoneOffset": 0, "clientName": "phone", "serviceName": "ringer"}
+        self.assertEqual({key: event[key] for key in expected}, expected)
+        self.assertEqual(set(event) - set(expected), {"_startTS", "_sessionID", "_clientTS", "eventTime"})
+        self.assertEqual(event["_startTS"] % 60, 0)
+        self.assertEqual(event["eventTime"], event["_clientTS"])
+        self.assertAlmostEqual(event["eventTime"], time.time(), delta=120)
+        self.assertEqual(len(event["_sessionID"]), 24)
+        self.assertEqual({e["_sessionID"] for e in (start, event, stop)}, {event["_sessionID"]})
+        post = next(p for p in self.lab.received("events") if p["body"]["events"][0] == event)
+        self.assertEqual(set(post["body"]), {"postTime", "clientId", "events"})
+        self.assertAlmostEqual(post["body"]["postTime"], time.time(), delta=120)
+        self.assertEqual(len(post["body"]["clientId"]), 36)
+        headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer", "User-Agent": "Veltra/8.0 (Elm4,2; 12.1)",
+                   "X-VLT-Client-Version": "3", "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 1",
+                   "Accept": "application/json", "Content-Type": "application/json",
+                   "Content-Length": str(post["bytes"])}
+        self.assertEqual({key: post["headers"].get(key) for key in headers}, headers)
+        self.assertNotIn("X-VLT-Internal-Build", post["headers"])
+        self.assertEqual((post["method"], post["path"]), ("POST", "/events"))
+        self.assertEqual(post["compressed"], post["headers"].get("Content-Encoding") == "gzip")
+        logs = list((self.root.path / "var/mobile/Library/Logs/Zentrel/Retired").iterdir())
+        self.assertEqual(sum(log.read_text().count("[httppost -> sendMessageWithDictionary]") for log in logs), 3)
+
+    def test_batch_and_realtime(self):
+        with self.serving():
+            session, _ = self.open(7, "--batch-events")
+            for number in range(3):
+                session.send(number=number)
+            self.assertEqual(self.lab.received("events"), [])
+            answer = session.ask("flush")
+            self.assertIsNone(answer["error"])
+            self.assertEqual(len(json.loads(answer["reply"])["events"]), 4)
+            session.send(number=3)
+            session.ask("send", category=6, type=2, flag=1, payload={"urgent": True})
+            batch, _, urgent = sorted(self.lab.received("events", 3),
+                                      key=lambda p: (p["path"], -len(p["body"]["events"])))
+            session.close()
+            self.lab.wait_for_events(1, _method=0, _status=1)
+        self.assertEqual([e.get("number") for e in batch["body"]["events"]], [None, 0, 1, 2])
+        self.assertNotIn("X-VLT-Event-Map", batch["headers"])
+        self.assertTrue(batch["compressed"])
+        self.assertEqual((urgent["path"], urgent["headers"]["X-VLT-Event-Map"]), ("/realtime", "6 2"))
+
+    def test_server_error_disables_the_backend(self):
+        with self.serving():
+            session, _ = self.open(7, "--batch-events")
+            self.lab.control(path="/events", status=503, times=1)
+            error = session.ask("flush")["error"]
+            self.assertEqual(error, {"domain": "com.florn.veltra.error", "code": 503,
+                                     "description": "backend httppost disabled by server 503 return code"})
+            self.assertIsNone(session.send()["reply"])
+            self.assertEqual(session.ask("states", userInfo={"clientName": "phone", "serviceName": "ringer"})["backends"], [])
+            # A changed identity has the states computed anew.
+            self.assertEqual(session.ask("states", userInfo={"clientName": "phone", "serviceName": "bell"})["backends"],
+                             ["httppost"])
+
+    def test_hierarchy_and_aggregation(self):
+        for name, number in (("quindle", 0), ("ostvane", 1)):
+            self.lab.put(name, storebag(hierarchy=number))
+        with self.serving():
+            root, _ = self.open(7, "--aggregate", session_id=1)
+            self.assertEqual(root.answer()["op"], "aggregated")  # its own start message
+            child, _ = self.open(6, session_id=2)
+            child.send(codec="opus")
+            copies = [root.answer(), root.answer()]
+            self.assertEqual([(c["category"], c["type"]) for c in copies], [(0, 0), (5, 1)])
+            self.assertEqual((copies[1]["sessionInfo"]["sessionID"], copies[1]["payload"]["codec"],
+                              copies[1]["payload"]["clientName"]), (2, "opus", "phone"))
+            event, = self.lab.wait_for_events(1, _method=5)
+            parent = self.lab.wait_for_events(1, _sender="JY")[0]["_sessionID"]
+            self.assertEqual(event["_sessionID"].split(".")[0], parent)
+            self.assertEqual(len(event["_sessionID"].split(".")), 2)
+
+    def test_examples(self):
+        """The clients in C and in Python do what they say."""
+        with self.serving("user info provided without requiring it"):
+            for number, command in enumerate(([program("hello")], ["python3", str(SOURCE / "examples/hello.py")]), 1):
+                done = subprocess.run(command, env=self.root.environment(), capture_output=True, timeout=30)
+                self.assertEqual(done.returncode, 0, (command, done.stderr.decode()))
+                wait_until(lambda: len([e for e in self.lab.events() if e["_method"] != 0]) >= number,
+                           f"an event of {command}")
+
+
+class Ctl(SystemTest):
+    def test_every_operation_of_a_session(self):
+        lines = ["", '{"op":"displayURL"}', "no json", '{"op":"dance"}', '{"op":"send"}', '{"op":"send","category":1}',
+                 '{"op":"sleep","ms":1}', '{"op":"flush"}', '{"op":"restart"}',
+                 '{"op":"states","userInfo":{"clientName":"phone","serviceName":"ringer"}}', '{"op":"finish"}']
+        with self.serving() as daemon:
+            out, _ = self.ctl("session", "--client-type", "7", "--client", "phone", "--service", "ringer",
+                              "--require-user-info", input="\n".join(lines) + "\n")
+            daemon.wait_for_line("sendMessageWithDictionary: Missing mandatory parameter 'category'")
+            daemon.wait_for_line("sendMessageWithDictionary: Missing mandatory parameter 'type'")
+            self.lab.wait_for_events(1, _method=0, _status=2)
+        answers = [json.loads(line) for line in out.splitlines()]
+        self.assertEqual([a["op"] for a in answers], ["start", "displayURL", "error", "error", "send", "send", "sleep",
+                                                      "flush", "restart", "states", "finish"])
+        start, url, bad, unknown, send, send2, _, flush, restart, states, _ = answers
+        self.assertEqual(url["reply"], "https://display.example/phone")
+        self.assertEqual((bad["line"], unknown["line"]), (3, 4))
+        self.assertIn("dance", unknown["description"])
+        self.assertEqual((send["reply"], send2["reply"]), (None, None))
+        self.assertEqual(flush, {"op": "flush", "reply": None, "error": {
+            "domain": "com.florn.veltra.error", "code": -1, "description": "Nothing to flush"}})
+        for answer in (start, restart, states):
+            self.assertEqual(answer["backends"], ["httppost"])
+
+    def test_single_calls(self):
+        with self.serving() as daemon:
+            identity = ["--client-type", "7", "--client", "phone", "--require-user-info"]
+            out, _ = self.ctl("send", *identity, "--category", "9", "--type", "4", "codec=opus")
+            self.assertEqual(json.loads(out)["op"], "send")
+            self.assertEqual(self.lab.wait_for_events(1, _method=9, _status=4)[0]["codec"], "opus")
+            self.assertIn("httppost", self.ctl("states", *identity)[0])
+            self.assertIn("https://display.example/phone", self.ctl("display-url", *identity)[0])
+            for wrong in (["dance"], ["session", "--client-type", "x"], ["send", *identity, "--category", "70000"]):
+                _, said = self.ctl(*wrong, status=2)
+                self.assertTrue(said)
+            daemon.wait_for_line("was invalidated", 3)
+
+    def test_stats(self):
+        with self.serving():
+            self.ctl("send", "--client-type", "2", "--category", "1", "--type", "1")
+            reason = "message dropped: the session has no back ends"
+
+            def counts():
+                counted = json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
+                return counted if counted.get(reason) == 2 else None  # the message and the session's stop message
+            wait_until(counts, "two counted drops")
+            self.assertIn(reason, self.ctl("stats")[0])
+            self.assertEqual(json.loads(self.ctl("stats", "--json")[0])["counts"][reason], 2)
+        _, said = self.ctl("stats", status=1)
+        self.assertIn("not running", said)

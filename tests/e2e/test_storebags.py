@@ -1,0 +1,154 @@
+"""What the daemon makes of storebags, good and bad, and of their servers."""
+import concurrent.futures
+import time
+
+from harness import SystemTest, closed_port, storebag
+
+FAILED = "fetchAndCacheStorebag: Unable to fetch storebag for client type "
+SECTION = "fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type "
+UNRESOLVED = "fetchStorebagWithName: Error resolving with lookup server "
+
+
+class Cache(SystemTest):
+    def test_client_types_share_one_download(self):
+        self.lab.control(path="/storebags", delayMs=300)
+        with self.serving() as daemon, concurrent.futures.ThreadPoolExecutor() as pool:
+            opened = list(pool.map(lambda client_type: self.open(client_type), (7, 13)))
+            self.assertEqual([backends for _, backends in opened], [["httppost"]] * 2)
+            daemon.wait_for_line("storebagForSession: Cached storebag found for client type ")
+            self.assertEqual({e["_sender"] for e in self.lab.wait_for_events(2)}, {"JY", "QOLIN"})
+            request, = self.lab.storebags()
+            self.assertEqual(request["path"], "/storebags/maple/quindle?version=8.0")
+            self.assertNotIn("If-Modified-Since", request["headers"])
+            self.assertEqual(self.open(2)[1], None)  # a client type without storebag, and without a download
+            daemon.allow("Could not find storebag name for client type 2")
+            daemon.wait_for_line("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type 2")
+            self.assertEqual(len(self.lab.storebags()), 1)
+
+    def test_lifetimes(self):
+        table = [(5, "pellmarch", "max-age=600", {}, 600), (6, "ostvane", "public, max-age=700", {}, 700),
+                 (8, "brevatto", "max-age=3600, private", {}, 3600), (9, "sollwick", "no-cache", {}, 86400),
+                 (10, "tamberlin", "max-age=86400", {"refresh_cycle": 1200}, 1200),
+                 (12, "crovish", "max-age=60", {"refresh_cycle": 200000}, 86400)]
+        with self.serving() as daemon:
+            for client_type, name, header, more, seconds in table:
+                with self.subTest(header, **more):
+                    self.lab.put(name, {**storebag(), **more})
+                    self.lab.control(path="/storebags", headers={"Cache-Control": header})
+                    self.assertEqual(self.open(client_type)[1], ["httppost"])
+                    daemon.wait_for_line(f"fetchAndCacheStorebag: Storebag max age: {seconds} seconds")
+
+
+class Conditional(SystemTest):
+    lab_arguments = ("--max-age", "0")
+
+    def test_request_with_date(self):
+        with self.serving() as daemon:
+            self.assertEqual(self.open()[1], ["httppost"])
+            self.assertEqual(self.open()[1], ["httppost"])
+            first, second = self.lab.storebags(2)
+            self.assertEqual((first["outcome"], second["outcome"]), ("200", "304"))
+            daemon.wait_for_line("fetchStorebagWithName: storebag content has not changed. using its cached version")
+            self.lab.put("quindle", storebag("v2", post_url="${url}/elsewhere"), age=0)
+            session, _ = self.open()
+            session.send()
+            session.close()
+            self.assertEqual(self.lab.wait_for_events(1, _status=1, _method=0)[0]["StorebagVersion"], "v2")
+            self.assertEqual(second["headers"]["If-Modified-Since"], self.lab.storebags(3)[2]["headers"]["If-Modified-Since"])
+            # Not modified, but without the date: a failure, and the section stays.
+            self.lab.control(path="/storebags", lastModified=False)
+            daemon.allow("fetchStorebagWithName: Signature is missing", "propertyListWithData error", FAILED, SECTION)
+            self.assertEqual(self.open()[1], ["httppost"])
+            daemon.wait_for_line("fetchStorebagWithName: Signature is missing")
+            self.assertEqual(self.open()[1], ["httppost"])
+            daemon.wait_for_line("storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds "
+                                 "between attempts")
+            self.assertEqual(len(self.lab.storebags()), 4)
+
+
+class Untrusted(SystemTest):
+    def test_what_is_not_signed_is_not_used(self):
+        unverified, missing = "fetchStorebagWithName: Signature can not be verified, ", "fetchStorebagWithName: Signature is missing"
+        table = [(5, "pellmarch", {"sign": "wrong"}, unverified), (6, "ostvane", {"sign": "missing"}, missing),
+                 (7, "quindle", {"sign": "none"}, missing), (8, "brevatto", {"body": "no property list"}, missing),
+                 (9, "sollwick", {"body": "bplist00" + "\x7f" * 64}, missing),
+                 (10, "tamberlin", {"status": 500, "body": ""}, missing),
+                 (12, "crovish", {"body": "<plist version='1.0'><dict><key>signature</key><string>AAAA</string><key>bag</key>"
+                                          "<string>!</string></dict></plist>"}, None)]
+        with self.serving(unverified, missing, FAILED, SECTION, "fetchStorebagWithName: propertyListWithData error ") as daemon:
+            for count, (client_type, name, rule, line) in enumerate(table, 1):
+                with self.subTest(**rule):
+                    self.lab.put(name, storebag())
+                    self.lab.control(path="/storebags", **rule)
+                    self.assertIsNone(self.open(client_type)[1])
+                    daemon.wait_for_line(f"{FAILED}{client_type}")
+                    if line:
+                        expected = sum(other[3] == line for other in table[:count])
+                        daemon.wait_for_line(line, expected)
+            self.assertEqual(self.lab.events(), [])
+
+
+class Servers(SystemTest):
+    """The storebag server fails; quindle's built-in storebag stands in, other names get nothing."""
+    allowed = (FAILED, SECTION, "mivo", "Mivo")
+
+    def fails(self, daemon):
+        self.assertIsNone(self.open(6)[1])
+        daemon.wait_for_line(UNRESOLVED)
+        daemon.wait_for_line(FAILED + "6")
+        self.assertIsNotNone(self.open(7)[1])
+        daemon.wait_for_line("fetchStorebagWithName: Loading default storebag 'quindle'")
+        daemon.wait_for_line("fetchAndCacheStorebag: Storebag max age: 3600 seconds")
+
+    def test_unreachable(self):
+        for url in (f"https://localhost:{closed_port()}/bags", "https://no-such-host.invalid/bags", "http://localhost/bags"):
+            with self.subTest(url):
+                self.root.prefer(veltra_storebag_url=url)
+                with self.serving(*self.allowed) as daemon:
+                    self.fails(daemon)
+        self.assertEqual(self.lab.storebags(), [])
+
+    def test_certificate_that_nobody_vouches_for(self):
+        (self.root.path / "etc/veltrad/ca.pem").unlink()
+        with self.serving(*self.allowed) as daemon:
+            self.fails(daemon)
+        self.assertEqual(self.lab.storebags(), [])
+
+    def test_broken_answers(self):
+        for rule in ({"cut": True}, {"cutHalfway": True}, {"endless": True}):
+            with self.subTest(**rule):
+                self.lab.control(path="/storebags", **rule)
+                with self.serving(*self.allowed) as daemon:
+                    self.fails(daemon)
+
+
+class Stalled(SystemTest):
+    def test_nobody_waits_for_a_server_that_he_did_not_ask_for(self):
+        self.lab.control(path="/storebags/maple/ostvane", stall=True)
+        with self.serving() as daemon:
+            waiting = self.start(6)
+            self.lab.storebags(1)
+            session, backends = self.open(7)
+            self.assertEqual(backends, ["httppost"])
+            session.send()
+            session.ask("finish")
+            session.close()
+            self.lab.wait_for_events(4)
+            daemon.wait_for_line("was invalidated")
+            self.assertEqual(waiting.text, [])
+            self.lab.reset()
+            self.assertEqual(waiting.answer()["backends"], ["httppost"])
+
+    def start(self, client_type):
+        from harness import Ctl
+        ctl = Ctl(self.root, client_type)
+        self.addCleanup(ctl.kill)
+        return ctl
+
+    def test_gives_up_after_15_seconds(self):
+        self.lab.control(path="/storebags", stall=True)
+        with self.serving(FAILED, SECTION) as daemon:
+            begin = time.monotonic()
+            self.assertIsNone(self.start(6).answer(25)["backends"])
+            self.assertAlmostEqual(time.monotonic() - begin, 15, delta=2)
+            daemon.wait_for_line(UNRESOLVED)
