@@ -14,9 +14,9 @@ struct JSONError {
   std::string detail;  // one line
 };
 
-// Numbers without a fraction or exponent become integers (beyond 64 bits: reals); {"$date": seconds since 1970}
-// becomes a date, {"$data": "base64"} data; null entries of a dictionary are left out, elsewhere null is an error.
-// Depth at most 64; duplicate keys: the last one counts.
+// Numbers without a fraction or exponent become integers (beyond 64 bits: reals); {"$date": seconds since
+// 1970} becomes a date, {"$data": "base64"} data; null entries of a dictionary are left out, elsewhere null
+// is an error. Depth at most 64; duplicate keys: the last one counts.
 Result<Value, JSONError> parseJSON(std::string_view text);
 
 enum class JSONStyle { compact, pretty };

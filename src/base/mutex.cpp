@@ -25,7 +25,8 @@ void taking(LockRank rank, bool recursive) {
   }
   const bool allowed = wanted > highest || (recursive && again);
   if (!allowed || held.count == kMostHeld) {
-    std::fprintf(stderr, "lock order: a lock of rank %d is wanted while one of rank %d is held\n", wanted, highest);
+    std::fprintf(stderr, "lock order: a lock of rank %d is wanted while one of rank %d is held\n", wanted,
+                 highest);
     std::abort();
   }
   held.ranks[held.count++] = wanted;

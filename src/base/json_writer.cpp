@@ -1,0 +1,107 @@
+// Writes JSON with RapidJSON's writers straight into a string. Any thread.
+#include <rapidjson/prettywriter.h>
+#include <rapidjson/writer.h>
+
+#include <cmath>
+
+#include "base/base64.h"
+#include "base/json.h"
+#include "base/text.h"
+
+namespace veltrad {
+
+namespace {
+
+// A stream as RapidJSON wants it, over a string.
+class StringStream {
+ public:
+  using Ch = char;
+  explicit StringStream(std::string& out) : _out(out) {}
+  void Put(char c) { _out.push_back(c); }
+  void Flush() {}
+
+ private:
+  std::string& _out;
+};
+
+template <typename Writer>
+void putText(Writer& writer, const std::string& text, bool isKey) {
+  if (!isUTF8(text)) return putText(writer, toUTF8(text), isKey);
+  const auto length = static_cast<rapidjson::SizeType>(text.size());
+  if (isKey) {
+    writer.Key(text.data(), length);
+  } else {
+    writer.String(text.data(), length);
+  }
+}
+
+template <typename Writer>
+void putReal(Writer& writer, double number) {
+  if (std::isfinite(number)) {
+    writer.Double(number);
+  } else {
+    writer.Null();
+  }
+}
+
+template <typename Writer>
+void put(Writer& writer, const Value& value) {
+  switch (value.type()) {
+    case Value::Type::boolean:
+      writer.Bool(*value.toBoolean());
+      return;
+    case Value::Type::signedInteger:
+      writer.Int64(*value.asSigned());
+      return;
+    case Value::Type::unsignedInteger:
+      writer.Uint64(*value.asUnsigned());
+      return;
+    case Value::Type::real:
+      return putReal(writer, *value.asReal());
+    case Value::Type::string:
+      return putText(writer, *value.asString(), false);
+    case Value::Type::date:
+      writer.StartObject();
+      putText(writer, "$date", true);
+      putReal(writer, value.asDate()->secondsSince1970);
+      writer.EndObject();
+      return;
+    case Value::Type::data:
+      writer.StartObject();
+      putText(writer, "$data", true);
+      putText(writer, encodeBase64(value.asData()->bytes), false);
+      writer.EndObject();
+      return;
+    case Value::Type::array:
+      writer.StartArray();
+      for (const Value& element : *value.asArray()) put(writer, element);
+      writer.EndArray();
+      return;
+    case Value::Type::dictionary:
+      writer.StartObject();
+      for (const auto& [key, held] : *value.asDictionary()) {
+        putText(writer, key, true);
+        put(writer, held);
+      }
+      writer.EndObject();
+      return;
+  }
+}
+
+}  // namespace
+
+std::string writeJSON(const Value& value, JSONStyle style) {
+  std::string out;
+  StringStream stream(out);
+  if (style == JSONStyle::pretty) {
+    rapidjson::PrettyWriter<StringStream> writer(stream);
+    writer.SetIndent(' ', 2);
+    put(writer, value);
+  } else {
+    rapidjson::Writer<StringStream> writer(stream);
+    put(writer, value);
+  }
+  return out;
+}
+
+}  // namespace veltrad
