@@ -19,19 +19,21 @@ using HTTPHeaders = std::vector<std::pair<std::string, std::string>>;
 
 struct HTTPRequest {
   enum class Method { get, post };
-  // What bounds apply. Storebag requests are always admitted; event posts share 1,024 requests and 64 MiB; uploads
-  // run two at a time, others wait.
+  // What bounds apply. Storebag requests are always admitted; event posts share 1,024 requests and 64 MiB;
+  // uploads run two at a time, others wait.
   enum class Lane { storebag, event, upload };
 
   Method method = Method::get;
   Lane lane = Lane::event;
   std::string url;  // https only
-  HTTPHeaders headers;  // control characters are removed from values; "Content-Length" is always the body's own
+  HTTPHeaders
+      headers;  // control characters are removed from values; "Content-Length" is always the body's own
   std::string body;
   std::chrono::milliseconds timeout{60'000};  // total; connecting alone at most 10 s
   // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.
   std::uint32_t leastBytesPerSecond = 0;
-  std::size_t mostResponseBytes = 16u << 20;  // beyond it the transfer ends with an error; counted as bytes come
+  std::size_t mostResponseBytes = 16u
+                                  << 20;  // beyond it the transfer ends with an error; counted as bytes come
 };
 
 struct HTTPResponse {
@@ -69,7 +71,8 @@ struct HTTPClientSettings {
   std::string extraCertificatesPath;  // PEM, trusted beside the system's; no such file: none
 };
 
-// libcurl's multi interface on one thread, which starts with the first request. Never forks; SIGPIPE must be ignored.
+// libcurl's multi interface on one thread, which starts with the first request. Never forks; SIGPIPE must be
+// ignored.
 class CurlHTTPClient final : public HTTPClient {
  public:
   explicit CurlHTTPClient(HTTPClientSettings settings);

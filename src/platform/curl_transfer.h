@@ -1,0 +1,79 @@
+// One HTTPS exchange: its request, how libcurl is set up for it, and what came back. HTTP thread once it is
+// filed.
+#pragma once
+
+#include <curl/curl.h>
+
+#include <array>
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/http_client.h"
+#include "platform/trust_store.h"
+
+namespace veltrad::platform {
+
+// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `trust` must
+// live.
+class CurlTransfer {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+
+  CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool blocking, Time now);
+  CurlTransfer(const CurlTransfer&) = delete;
+  CurlTransfer& operator=(const CurlTransfer&) = delete;
+
+  HTTPRequest::Lane lane() const { return _request.lane; }
+  const std::string& host() const {
+    return _host;
+  }  // "name:port" as the URL has it: what connections are counted by
+  std::size_t bodySize() const { return _bodySize; }
+  bool blocking() const { return _blocking; }  // somebody waits in perform()
+  bool expired(Time now) const { return _deadline && *_deadline <= now; }
+
+  // Over its lane's bound: the body is let go, and it only waits to be told.
+  void refuse(HTTPError error);
+  const std::optional<HTTPError>& refused() const { return _refused; }
+
+  // Sets `easy` up, which is fresh or reset. False: libcurl has no memory for it.
+  bool attach(CURL* easy, TrustStore& trust, Time now);
+  // What libcurl's verdict means; reads the attached handle.
+  HTTPResult result(CURLcode code, CURL* easy);
+  HTTPError timedOutWaiting() const;
+
+  // Once, without any lock; lets the completion go.
+  void complete(HTTPResult result);
+
+ private:
+  struct FreeList {
+    void operator()(curl_slist* list) const { curl_slist_free_all(list); }
+  };
+
+  bool setHeaders(CURL* easy);
+  void setBody(CURL* easy);
+  void setLimits(CURL* easy, Time now);
+  void setTrust(CURL* easy, TrustStore& trust);
+  bool admits(std::size_t more);
+  std::string describe(CURLcode code) const;
+
+  static std::size_t takeBody(char* bytes, std::size_t size, std::size_t count, void* self);
+  static std::size_t takeHeader(char* bytes, std::size_t size, std::size_t count, void* self);
+
+  HTTPRequest _request;
+  HTTPCompletion _completion;
+  const bool _blocking;
+  const std::string _host;
+  const std::size_t _bodySize;
+  const std::optional<Time> _deadline;  // none: a least speed holds instead
+  std::optional<HTTPError> _refused;
+
+  std::unique_ptr<curl_slist, FreeList> _headerList;
+  std::array<char, CURL_ERROR_SIZE> _error{};
+  std::string _body;
+  std::size_t _received = 0;  // header and body bytes
+  std::size_t _headerBytes = 0;
+};
+
+}  // namespace veltrad::platform

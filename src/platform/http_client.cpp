@@ -1,0 +1,129 @@
+// HTTPS requests: the callers' side. Any thread.
+#include "platform/http_client.h"
+
+#include <atomic>
+#include <cstdlib>
+#include <mutex>
+#include <system_error>
+#include <thread>
+
+#include "base/mutex.h"
+#include "base/text.h"
+#include "platform/http_inbox.h"
+#include "platform/http_worker.h"
+#include "platform/log.h"
+
+namespace veltrad::platform {
+
+namespace {
+
+// One perform(): its thread waits here for the HTTP thread.
+class Answer {
+ public:
+  void give(HTTPResult result) {
+    const Lock lock(_mutex);
+    _result.emplace(std::move(result));
+    _given.notifyOne();
+  }
+  HTTPResult wait() {
+    const Lock lock(_mutex);
+    while (!_result) _given.wait(_mutex);
+    return std::move(*_result);
+  }
+
+ private:
+  Mutex _mutex{LockRank::leaf};
+  Condition _given;
+  std::optional<HTTPResult> _result GUARDED_BY(_mutex);
+};
+
+}  // namespace
+
+std::optional<std::string_view> HTTPResponse::header(std::string_view name) const {
+  for (const auto& [key, value] : headers) {
+    if (equalIgnoringCase(key, name)) return value;
+  }
+  return std::nullopt;
+}
+
+struct CurlHTTPClient::Impl {
+  explicit Impl(HTTPClientSettings given) : settings(std::move(given)) {}
+
+  // Nothing of libcurl is touched before the first request.
+  void file(HTTPRequest request, HTTPCompletion completion, bool blocking) {
+    std::call_once(once, [this] { startThread(); });
+    const auto now = std::chrono::steady_clock::now();
+    if (inbox.add(std::make_unique<CurlTransfer>(std::move(request), std::move(completion), blocking, now))) {
+      worker->wake();
+    }
+  }
+  void startThread() {
+    worker = std::make_unique<HTTPWorker>(inbox, settings.extraCertificatesPath);
+    try {
+      thread = std::thread([this] { worker->run(); });
+    } catch (const std::system_error& error) {
+      logError("The HTTP thread cannot be started: %s", error.what());
+      std::abort();
+    }
+    started.store(true, std::memory_order_release);
+  }
+  // False when there is no thread yet.
+  bool wake() {
+    const bool there = started.load(std::memory_order_acquire);
+    if (there) worker->wake();
+    return there;
+  }
+
+  const HTTPClientSettings settings;
+  HTTPInbox inbox;
+  std::once_flag once;
+  std::atomic<bool> started{false};
+  std::unique_ptr<HTTPWorker> worker;  // both set once, before `started`
+  std::thread thread;
+};
+
+CurlHTTPClient::CurlHTTPClient(HTTPClientSettings settings)
+    : _impl(std::make_unique<Impl>(std::move(settings))) {}
+
+CurlHTTPClient::~CurlHTTPClient() {
+  _impl->inbox.stop(true);
+  if (_impl->wake()) _impl->thread.join();
+}
+
+void CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
+  _impl->file(std::move(request), std::move(completion), false);
+}
+
+HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
+  if (_impl->inbox.blockingFails())
+    return Failure{HTTPError{HTTPError::Kind::stopping, "The daemon is stopping"}};
+  const auto answer =
+      std::make_shared<Answer>();  // the giver may still be at its lock when the waiter has gone
+  _impl->file(
+      std::move(request), [answer](HTTPResult result) { answer->give(std::move(result)); }, true);
+  return answer->wait();
+}
+
+void CurlHTTPClient::failBlockingWaits() {
+  _impl->inbox.failBlocking();
+  _impl->wake();
+}
+
+void CurlHTTPClient::drain(std::chrono::steady_clock::time_point deadline) {
+  if (_impl->inbox.waitUntilIdle(deadline)) return;
+  _impl->inbox.stop(false);
+  _impl->wake();
+  _impl->inbox.waitUntilIdle(std::chrono::steady_clock::time_point::max());
+}
+
+bool CurlHTTPClient::passesEmptyTask(std::chrono::milliseconds within) {
+  const auto deadline = std::chrono::steady_clock::now() + within;
+  const std::uint64_t task = _impl->inbox.addEmptyTask();
+  return !_impl->wake() || _impl->inbox.waitForEmptyTask(task, deadline);
+}
+
+std::size_t CurlHTTPClient::underWay() const {
+  return _impl->inbox.events();
+}
+
+}  // namespace veltrad::platform

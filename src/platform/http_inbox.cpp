@@ -1,0 +1,91 @@
+// The HTTP thread's inbox. Any thread.
+#include "platform/http_inbox.h"
+
+#include <utility>
+
+namespace veltrad::platform {
+
+bool HTTPInbox::add(std::unique_ptr<CurlTransfer> transfer) {
+  const Lock lock(_mutex);
+  if (transfer->lane() == HTTPRequest::Lane::event) {
+    if (_events >= kMostEvents || transfer->bodySize() > kMostEventBytes - _eventBytes) {
+      transfer->refuse({HTTPError::Kind::tooMany, "Too many posts under way"});
+    } else {
+      ++_events;
+      _eventBytes += transfer->bodySize();
+    }
+  }
+  ++_underWay;
+  _arrived.push_back(std::move(transfer));
+  return _arrived.size() == 1;  // else the thread is already on its way
+}
+
+void HTTPInbox::failBlocking() {
+  const Lock lock(_mutex);
+  _failBlocking = true;
+}
+
+bool HTTPInbox::blockingFails() const {
+  const Lock lock(_mutex);
+  return _failBlocking;
+}
+
+void HTTPInbox::stop(bool forGood) {
+  const Lock lock(_mutex);
+  _stopping = true;
+  _last = _last || forGood;
+}
+
+bool HTTPInbox::waitUntilIdle(Time deadline) {
+  const Lock lock(_mutex);
+  while (_underWay != 0) {
+    if (!_changed.waitUntil(_mutex, deadline)) return _underWay == 0;
+  }
+  return true;
+}
+
+std::uint64_t HTTPInbox::addEmptyTask() {
+  const Lock lock(_mutex);
+  return ++_tasksAdded;
+}
+
+bool HTTPInbox::waitForEmptyTask(std::uint64_t task, Time deadline) {
+  const Lock lock(_mutex);
+  while (_tasksPassed < task) {
+    if (!_changed.waitUntil(_mutex, deadline)) return _tasksPassed >= task;
+  }
+  return true;
+}
+
+std::size_t HTTPInbox::events() const {
+  const Lock lock(_mutex);
+  return _events;
+}
+
+HTTPInbox::Taken HTTPInbox::take() {
+  Taken taken;
+  const Lock lock(_mutex);
+  taken.transfers.swap(_arrived);
+  taken.failBlocking = _failBlocking;
+  taken.stopping = _stopping;
+  taken.last = _last;
+  if (_tasksPassed != _tasksAdded) {
+    _tasksPassed = _tasksAdded;
+    _changed.notifyAll();
+  }
+  return taken;
+}
+
+void HTTPInbox::ended(const CurlTransfer& transfer) {
+  if (transfer.lane() != HTTPRequest::Lane::event || transfer.refused()) return;
+  const Lock lock(_mutex);
+  --_events;
+  _eventBytes -= transfer.bodySize();
+}
+
+void HTTPInbox::completed() {
+  const Lock lock(_mutex);
+  if (--_underWay == 0) _changed.notifyAll();
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,66 @@
+// Where any thread leaves requests for the HTTP thread, and the account of what is under way.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <vector>
+
+#include "base/mutex.h"
+#include "platform/curl_transfer.h"
+
+namespace veltrad::platform {
+
+// Its lock is a leaf. Never calls out.
+class HTTPInbox {
+ public:
+  using Time = CurlTransfer::Time;
+
+  static constexpr std::size_t kMostEvents = 1024;
+  static constexpr std::size_t kMostEventBytes = 64u << 20;
+
+  struct Taken {
+    std::vector<std::unique_ptr<CurlTransfer>> transfers;
+    bool failBlocking = false;  // those that wait in perform() end
+    bool stopping = false;      // everything ends
+    bool last = false;          // and then the thread
+  };
+
+  // Any thread; but for waits and questions the caller wakes the HTTP thread afterwards.
+
+  // Beyond its lane's bound the transfer is marked as refused; it is under way until it has been told so.
+  // False: the thread is already on its way.
+  bool add(std::unique_ptr<CurlTransfer> transfer);
+  void failBlocking();
+  bool blockingFails() const;
+  void stop(bool forGood);
+  std::uint64_t addEmptyTask();
+
+  // False when `deadline` passed first.
+  bool waitUntilIdle(Time deadline);
+  bool waitForEmptyTask(std::uint64_t task, Time deadline);
+  std::size_t events() const;
+
+  // HTTP thread.
+
+  Taken take();
+  // Before the completion: gives its share of the lane's bound back.
+  void ended(const CurlTransfer& transfer);
+  // After the completion.
+  void completed();
+
+ private:
+  mutable Mutex _mutex{LockRank::leaf};
+  Condition _changed;
+  std::vector<std::unique_ptr<CurlTransfer>> _arrived GUARDED_BY(_mutex);
+  std::size_t _underWay GUARDED_BY(_mutex) = 0;  // all lanes, completions that still run included
+  std::size_t _events GUARDED_BY(_mutex) = 0;
+  std::size_t _eventBytes GUARDED_BY(_mutex) = 0;
+  std::uint64_t _tasksAdded GUARDED_BY(_mutex) = 0;
+  std::uint64_t _tasksPassed GUARDED_BY(_mutex) = 0;
+  bool _failBlocking GUARDED_BY(_mutex) = false;
+  bool _stopping GUARDED_BY(_mutex) = false;
+  bool _last GUARDED_BY(_mutex) = false;
+};
+
+}  // namespace veltrad::platform

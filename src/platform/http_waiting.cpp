@@ -1,0 +1,71 @@
+// Which HTTP request runs next. HTTP thread.
+#include "platform/http_waiting.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace veltrad::platform {
+
+using Lane = HTTPRequest::Lane;
+
+void HTTPWaiting::add(Transfer transfer) {
+  Host* host = transfer->lane() == Lane::storebag ? nullptr : &_hosts[transfer->host()];
+  Queue& queue = host == nullptr ? _storebags : transfer->lane() == Lane::upload ? _uploads : host->posts;
+  queue.push_back(std::move(transfer));
+}
+
+HTTPWaiting::Transfer HTTPWaiting::next() {
+  if (!_storebags.empty()) return popFront(_storebags);
+  if (!_uploads.empty() && _uploadsRunning < kUploads) {
+    Host& host = _hosts[_uploads.front()->host()];
+    if (host.running < kPostConnections) {
+      ++host.running;
+      ++_uploadsRunning;
+      return popFront(_uploads);
+    }
+  }
+  for (auto& [name, host] : _hosts) {
+    if (host.posts.empty() || host.running >= kPostConnections) continue;
+    ++host.running;
+    return popFront(host.posts);
+  }
+  return nullptr;
+}
+
+void HTTPWaiting::ended(const CurlTransfer& transfer) {
+  if (transfer.lane() == Lane::storebag) return;
+  if (transfer.lane() == Lane::upload) --_uploadsRunning;
+  const auto found = _hosts.find(transfer.host());
+  if (--found->second.running == 0 && found->second.posts.empty()) _hosts.erase(found);
+}
+
+bool HTTPWaiting::empty() const {
+  return _storebags.empty() && _uploads.empty() &&
+         std::all_of(_hosts.begin(), _hosts.end(),
+                     [](const auto& host) { return host.second.posts.empty(); });
+}
+
+std::vector<HTTPWaiting::Transfer> HTTPWaiting::take(const Predicate& matches) {
+  std::vector<Transfer> taken;
+  takeFrom(_storebags, matches, taken);
+  takeFrom(_uploads, matches, taken);
+  for (auto& [name, host] : _hosts) takeFrom(host.posts, matches, taken);
+  std::erase_if(_hosts,
+                [](const auto& host) { return host.second.running == 0 && host.second.posts.empty(); });
+  return taken;
+}
+
+HTTPWaiting::Transfer HTTPWaiting::popFront(Queue& queue) {
+  Transfer front = std::move(queue.front());
+  queue.pop_front();
+  return front;
+}
+
+void HTTPWaiting::takeFrom(Queue& queue, const Predicate& matches, std::vector<Transfer>& taken) {
+  const auto first = std::stable_partition(queue.begin(), queue.end(),
+                                           [&](const Transfer& transfer) { return !matches(*transfer); });
+  taken.insert(taken.end(), std::make_move_iterator(first), std::make_move_iterator(queue.end()));
+  queue.erase(first, queue.end());
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,47 @@
+// Whom HTTPS connections trust: the system's certificate authorities and the extra ones of a PEM file. HTTP
+// thread.
+#pragma once
+
+#include <sys/stat.h>
+
+#include <memory>
+#include <string>
+
+// OpenSSL's own names, so that its headers stay in the body.
+using X509_STORE = struct x509_store_st;
+
+namespace veltrad::platform {
+
+// One store serves every connection: the system's directory is looked into by need, so making a connection
+// loads nothing. The extra file is read again when its stamp has changed. One thread only.
+class TrustStore {
+ public:
+  // PEM; empty or no such file: the system's authorities alone.
+  explicit TrustStore(std::string extraCertificatesPath);
+  ~TrustStore();
+
+  // Null only when OpenSSL cannot make a store. Lives until the next call.
+  X509_STORE* current();
+
+ private:
+  struct Stamp {
+    dev_t device = 0;
+    ino_t file = 0;
+    off_t size = -1;
+    timespec modified{};
+    bool operator==(const Stamp& other) const;
+  };
+  struct Free {
+    void operator()(X509_STORE* store) const;
+  };
+  using Store = std::unique_ptr<X509_STORE, Free>;
+
+  Stamp stampNow() const;
+  Store make(bool withExtra) const;
+
+  const std::string _extraCertificatesPath;
+  Store _store;
+  Stamp _stamp;
+};
+
+}  // namespace veltrad::platform
