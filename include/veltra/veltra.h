@@ -6,6 +6,9 @@
  *
  * Nothing here throws, and no function but those that end in _wait, veltra_session_close and veltra_session_create
  * waits for anything.
+ *
+ * Processes: the descriptors are closed by exec. After a fork the session belongs to the parent: the child must not
+ * use it, close included, and opens one of its own. No signal handler runs on a session's thread.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -39,8 +42,9 @@ VELTRA_API const char* veltra_version(void);
 /* ---- Values: booleans, integers, reals, texts (UTF-8), dates, data, arrays, dictionaries ----
  *
  * Counted references: each create returns one reference, which the caller releases, or hands over where a function
- * says that it takes it. A value that is part of another must not be changed any more. NULL is "no value" and every
- * function takes it as such.
+ * says that it takes it. A value that is part of another cannot be changed any more (VELTRA_INVALID); containers nest
+ * at most 64 deep. Bytes of a text that are no UTF-8 become U+FFFD. NULL is "no value" and every function takes it as
+ * such.
  */
 typedef struct veltra_value veltra_value;
 
@@ -69,7 +73,7 @@ VELTRA_API veltra_value* veltra_array(void);
 VELTRA_API veltra_value* veltra_dictionary(void);
 
 /* Both take over the reference to `value`, also when they fail (VELTRA_INVALID: wrong kind of container, no key, no
- * value). A key that is there already gets the new value. */
+ * value, nested too deep). A key that is there already gets the new value. */
 VELTRA_API veltra_status veltra_array_append(veltra_value* array, veltra_value* value);
 VELTRA_API veltra_status veltra_dictionary_set(veltra_value* dictionary, const char* key, veltra_value* value);
 
@@ -141,7 +145,8 @@ typedef struct veltra_session_options {
   /* Not NULL: this session aggregates. */
   veltra_aggregation_callback aggregated;
   void* aggregated_context;
-  /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped. */
+  /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped; one that has the queue
+   * for itself may be larger. */
   size_t queue_bytes;
 } veltra_session_options;
 
@@ -186,16 +191,18 @@ VELTRA_API veltra_status veltra_session_finish_wait(veltra_session*, veltra_repl
 
 typedef struct veltra_statistics {
   uint64_t sent;     /* calls handed to the daemon */
-  uint64_t dropped;  /* calls refused because the queue was full or nobody listened */
+  uint64_t dropped;  /* calls refused, or given up in the queue, because it was full or nobody listened */
   uint64_t queued;   /* calls that wait to be written, now */
   uint64_t replies;  /* answers received */
   uint64_t unanswered; /* calls that ended without an answer */
+  uint64_t dropped_events; /* aggregated copies lost because their callbacks did not keep up (4,096 may wait) */
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
 
 /* Writes out what waits, for at most 2 s, closes the connection, ends calls without an answer with VELTRA_NO_REPLY
- * (their callbacks run before this returns), frees the session. Returns how many calls were lost unwritten. Not to
- * be called inside a callback. NULL does nothing. */
+ * (their callbacks run before this returns), frees the session. Returns how many calls were lost unwritten. Inside a
+ * callback it does nothing and returns 0. No call may start any more once this has been called; waiting calls that are
+ * under way end. NULL does nothing. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus

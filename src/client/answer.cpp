@@ -1,0 +1,119 @@
+// Reading replies, and the C interface's functions on them. Any thread.
+#include "client/answer.h"
+
+#include "base/property_list.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+namespace {
+
+// The daemon's own words for a callback that was let go without being called.
+constexpr std::string_view kNoReplyDescription = "The daemon gave no reply.";
+
+Answer unreadable() {
+  return answerOfStatus(VELTRA_NO_REPLY, "The daemon's reply could not be read.");
+}
+
+}  // namespace
+
+ReportingError errorOfDictionary(const Dictionary& dictionary) {
+  ReportingError error;
+  if (const std::string* domain = dictionary.string("domain")) error.domain = *domain;
+  const Value* code = dictionary.find("code");
+  error.code = code ? code->toInt64().value_or(-1) : -1;
+  if (const std::string* description = dictionary.string("description")) error.description = *description;
+  return error;
+}
+
+Answer answerOfStatus(veltra_status status, const char* description) {
+  auto answer = std::make_unique<veltra_reply>();
+  answer->status = status;
+  if (status != VELTRA_OK) {
+    answer->error =
+        ReportingError{kVeltraErrorDomain, -1, description ? description : veltra_status_text(status)};
+  }
+  return answer;
+}
+
+Answer answerOfReply(std::string_view body) {
+  const auto parsed = parseBinaryPropertyList(body);
+  const Dictionary* reply = parsed ? parsed.value().asDictionary() : nullptr;
+  if (!reply) return unreadable();
+  auto answer = std::make_unique<veltra_reply>();
+  if (const Dictionary* error = reply->dictionary("error")) {
+    answer->error = errorOfDictionary(*error);
+    answer->status = answer->error->description == kNoReplyDescription ? VELTRA_NO_REPLY : VELTRA_REFUSED;
+    return answer;
+  }
+  const Dictionary* results = reply->dictionary("results");
+  if (!results) return unreadable();
+  if (const std::string* text = results->string("reply")) answer->text = *text;
+  const Value* backends = results->find("backends");
+  if (backends && backends->asArray()) answer->backends = nodeOfValue(*backends);
+  answer->uploaded = results->boolean("uploaded").value_or(false);
+  if (const Dictionary* error = results->dictionary("error")) answer->error = errorOfDictionary(*error);
+  return answer;
+}
+
+}  // namespace veltrad
+
+veltra_status veltra_reply_status(const veltra_reply* reply) {
+  return reply ? reply->status : VELTRA_INVALID;
+}
+
+const char* veltra_reply_text(const veltra_reply* reply, size_t* length) {
+  const bool there = reply && reply->text;
+  if (length) *length = there ? reply->text->size() : 0;
+  return there ? reply->text->c_str() : nullptr;
+}
+
+const veltra_value* veltra_reply_backends(const veltra_reply* reply) {
+  return reply ? reply->backends.get() : nullptr;
+}
+
+bool veltra_reply_uploaded(const veltra_reply* reply) {
+  return reply && reply->uploaded;
+}
+
+const char* veltra_reply_error_domain(const veltra_reply* reply) {
+  return reply && reply->error ? reply->error->domain.c_str() : nullptr;
+}
+
+int64_t veltra_reply_error_code(const veltra_reply* reply) {
+  return reply && reply->error ? reply->error->code : 0;
+}
+
+const char* veltra_reply_error_description(const veltra_reply* reply) {
+  return reply && reply->error ? reply->error->description.c_str() : nullptr;
+}
+
+void veltra_reply_release(veltra_reply* reply) {
+  delete reply;
+}
+
+const char* veltra_status_text(veltra_status status) {
+  switch (status) {
+    case VELTRA_OK:
+      return "Done.";
+    case VELTRA_NO_DAEMON:
+      return "No daemon listens, or the connection to it has ended.";
+    case VELTRA_REFUSED:
+      return "The daemon refused.";
+    case VELTRA_QUEUE_FULL:
+      return "The session's queue is full; the call was dropped.";
+    case VELTRA_INVALID:
+      return "An argument is not what it must be; nothing was done.";
+    case VELTRA_NO_REPLY:
+      return "The call ended without an answer.";
+    case VELTRA_WOULD_DEADLOCK:
+      return "A waiting call inside a callback would wait for itself.";
+    case VELTRA_TOO_LARGE:
+      return "The call is larger than a frame may be; nothing was sent.";
+  }
+  return "Unknown status.";
+}
+
+const char* veltra_version(void) {
+  return "8.0";
+}

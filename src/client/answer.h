@@ -1,0 +1,34 @@
+// The answer to a call, as the C interface's veltra_reply holds it. A value with one owner; any thread.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "base/value.h"
+#include "client/value_node.h"
+#include "protocol/error.h"
+#include "veltra/veltra.h"
+
+struct veltra_reply {
+  veltra_status status = VELTRA_OK;
+  std::optional<std::string> text;
+  veltrad::ValuePointer backends;
+  bool uploaded = false;
+  std::optional<veltrad::ReportingError> error;
+};
+
+namespace veltrad {
+
+using Answer = std::unique_ptr<veltra_reply>;
+
+// The body of a reply frame. One that cannot be read ends its call with VELTRA_NO_REPLY and says so.
+Answer answerOfReply(std::string_view body);
+// A call that ended without the daemon's word; the description is the status's own text unless one is given.
+Answer answerOfStatus(veltra_status status, const char* description = nullptr);
+// {"domain", "code", "description"} as the wire carries it; what is missing or of another type is empty.
+ReportingError errorOfDictionary(const Dictionary& dictionary);
+
+}  // namespace veltrad

@@ -1,0 +1,96 @@
+// Argument dictionaries of the calls. Any thread.
+#include "client/calls.h"
+
+#include "base/property_list.h"
+#include "base/text.h"
+#include "ipc/frame.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+namespace {
+
+using Entries = std::vector<Dictionary::Entry>;
+
+// What the daemon reads at most, less the frame's own dictionaries around it.
+constexpr int kDeepestArgument = 60;
+
+bool absentOrDictionary(const veltra_value* value) {
+  return !value || value->entries();
+}
+
+bool fits(const veltra_value* value) {
+  const PropertyListLimits limits;
+  return !value || (value->depth <= kDeepestArgument && value->objects < limits.objects - 100);
+}
+
+std::string mended(const char* text) {
+  return toUTF8(text);
+}
+
+Value sessionInfo(const veltra_session_options& options) {
+  Dictionary info;
+  if (options.has_session_id) info.set(kVeltraSessionInfoSessionID, options.session_id);
+  if (options.has_client_type) info.set(kVeltraSessionInfoClientType, options.client_type);
+  if (options.has_client_version) {
+    info.set(kVeltraSessionInfoClientVersion, static_cast<unsigned>(options.client_version));
+  }
+  info.set(kVeltraSessionInfoRequireUserInfo, options.require_user_info);
+  info.set(kVeltraSessionInfoBatchEvent, options.batch_events);
+  return info;
+}
+
+}  // namespace
+
+CallFrame callFrame(const char* operation, Entries arguments) {
+  Entries body;
+  body.reserve(2);
+  body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
+  body.emplace_back("op", operation);
+  std::string frame = ipc::makeFrame(ipc::FrameKind::call, 0, Dictionary::fromEntries(std::move(body)));
+  if (frame.size() - ipc::kFrameHeaderBytes > ipc::kFrameBodyLimit) return {VELTRA_TOO_LARGE, {}};
+  return {VELTRA_OK, std::move(frame)};
+}
+
+CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
+                       std::uint32_t flag) {
+  if (!absentOrDictionary(payload)) return {VELTRA_INVALID, {}};
+  if (!fits(payload)) return {VELTRA_TOO_LARGE, {}};
+  Entries message;
+  message.reserve(4);
+  message.emplace_back(kVeltraMessageParametersCategory, static_cast<unsigned>(category));
+  if (flag != 0) message.emplace_back(kVeltraMessageParametersFlag, flag);
+  if (payload) message.emplace_back(kVeltraMessageParametersPayload, dictionaryOfNode(payload));
+  message.emplace_back(kVeltraMessageParametersType, static_cast<unsigned>(type));
+  if (flag == 0) return callFrame(kSendMessage, std::move(message));
+  Entries arguments;
+  arguments.emplace_back("message", Dictionary::fromEntries(std::move(message)));
+  return callFrame(kSendDictionary, std::move(arguments));
+}
+
+CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary,
+                          Missing missing) {
+  if (!absentOrDictionary(dictionary) || (!dictionary && missing == Missing::invalid))
+    return {VELTRA_INVALID, {}};
+  if (!fits(dictionary)) return {VELTRA_TOO_LARGE, {}};
+  Entries arguments;
+  if (dictionary) arguments.emplace_back(argument, dictionaryOfNode(dictionary));
+  return callFrame(operation, std::move(arguments));
+}
+
+CallFrame sessionInfoFrame(const veltra_session_options& options) {
+  if (!absentOrDictionary(options.user_info)) return {VELTRA_INVALID, {}};
+  if (!fits(options.user_info)) return {VELTRA_TOO_LARGE, {}};
+  Entries arguments;
+  arguments.emplace_back("sessionInfo", sessionInfo(options));
+  arguments.emplace_back("hasAggregationBlock", options.aggregated != nullptr);
+  if (options.user_info || options.client_name || options.service_name) {
+    Dictionary userInfo = dictionaryOfNode(options.user_info);
+    if (options.client_name) userInfo.set(kVeltraUserInfoClientName, mended(options.client_name));
+    if (options.service_name) userInfo.set(kVeltraUserInfoServiceName, mended(options.service_name));
+    arguments.emplace_back("userInfo", std::move(userInfo));
+  }
+  return callFrame(kSetSessionInfo, std::move(arguments));
+}
+
+}  // namespace veltrad

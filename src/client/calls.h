@@ -1,0 +1,40 @@
+// The calls of a session as frames, ready for the wire but for their call id. Pure functions; any thread.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "base/value.h"
+#include "client/value_node.h"
+#include "veltra/veltra.h"
+
+namespace veltrad {
+
+inline constexpr const char* kFetchStates = "fetchStatesWithUserInfo:completionHandler:";
+inline constexpr const char* kFetchDisplayURL = "fetchDisplayURL:";
+inline constexpr const char* kFinishSession = "finishSessionWithReply:";
+inline constexpr const char* kFlushMessages = "flushMessagesWithCompletion:";
+inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:";
+inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
+inline constexpr const char* kSetSessionInfo =
+    "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
+inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
+
+struct CallFrame {
+  veltra_status status;  // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE
+  std::string frame;     // empty unless VELTRA_OK
+};
+
+CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});
+// `payload` is a dictionary or null. Without a flag the call has no room for one; with one it goes as a
+// dictionary.
+CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
+                       std::uint32_t flag);
+// A call whose one argument is a dictionary; left out where it is null and may be missing.
+enum class Missing { allowed, invalid };
+CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary,
+                          Missing missing);
+CallFrame sessionInfoFrame(const veltra_session_options& options);
+
+}  // namespace veltrad

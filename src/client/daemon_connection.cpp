@@ -1,0 +1,391 @@
+// Calls out, answers and events in. See the header for who reads.
+#include "client/daemon_connection.h"
+
+#include <fmt/format.h>
+#include <poll.h>
+#include <sys/epoll.h>
+#include <sys/eventfd.h>
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+
+#include "base/property_list.h"
+
+namespace veltrad {
+
+namespace {
+
+constexpr std::chrono::seconds kClosingTimeout{2};
+constexpr std::size_t kReadBytes = 16u << 10;
+// Room for a caller's callbacks; only what they touch costs memory.
+constexpr std::size_t kStackBytes = 4u << 20;
+constexpr std::uint32_t kHangUps = EPOLLRDHUP | EPOLLHUP | EPOLLERR;
+constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
+
+void setCallID(std::string& frame, std::uint32_t callID) {
+  ipc::FrameHeader header = ipc::decodeFrameHeader(frame.data());
+  header.callID = callID;
+  ipc::encodeFrameHeader(header, frame.data());
+}
+
+}  // namespace
+
+std::unique_ptr<DaemonConnection> DaemonConnection::make(DaemonSocket daemon, std::size_t queueBytes,
+                                                         EventHandler handler, std::string& error) {
+  std::unique_ptr<DaemonConnection> made(
+      new DaemonConnection(std::move(daemon), queueBytes, std::move(handler)));
+  Lock lock(made->_lock);
+  made->_interest = EPOLLRDHUP | (made->_handler ? EPOLLIN : 0u);
+  epoll_event socketEvent{};
+  socketEvent.events = made->_interest;
+  socketEvent.data.fd = made->_socket.get();
+  epoll_event wakeUpEvent{};
+  wakeUpEvent.events = EPOLLIN;
+  wakeUpEvent.data.fd = made->_wakeUp.get();
+  if (!made->_epoll.isOpen() || !made->_wakeUp.isOpen() ||
+      ::epoll_ctl(made->_epoll.get(), EPOLL_CTL_ADD, made->_socket.get(), &socketEvent) != 0 ||
+      ::epoll_ctl(made->_epoll.get(), EPOLL_CTL_ADD, made->_wakeUp.get(), &wakeUpEvent) != 0) {
+    error = fmt::format("The session got no descriptors: {}; raise the limit on open files.",
+                        std::error_code(errno, std::generic_category()).message());
+    return nullptr;
+  }
+  DaemonConnection* connection = made.get();
+  if (!made->_thread.start("veltra", kStackBytes, [connection] { connection->run(); })) {
+    error = "The session got no thread: raise the limit on tasks.";
+    return nullptr;
+  }
+  return made;
+}
+
+DaemonConnection::DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, EventHandler handler)
+    : _socket(std::move(daemon.socket)),
+      _epoll(::epoll_create1(EPOLL_CLOEXEC)),
+      _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
+      _queueBytes(queueBytes),
+      _handler(std::move(handler)),
+      _frames(std::move(daemon.reader)) {}
+
+DaemonConnection::~DaemonConnection() {
+  if (_thread.running()) close();
+}
+
+// ---- Calls out ----
+
+veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context) {
+  Lock lock(_lock);
+  return enqueue(std::move(frame), Call{nullptr, callback, context});
+}
+
+Answer DaemonConnection::sendAndWait(std::string frame) {
+  if (onOwnThread()) return answerOfStatus(VELTRA_WOULD_DEADLOCK);
+  Waiter waiter;
+  Lock lock(_lock);
+  const veltra_status status = enqueue(std::move(frame), Call{&waiter, nullptr, nullptr});
+  if (status != VELTRA_OK) return answerOfStatus(status);
+  ++_inside;
+  while (!waiter.answer) {
+    if (_reader == Reader::nobody) {
+      readAsWaiter(waiter);
+    } else {
+      _parked.push_back(&waiter);
+      waiter.changed.wait(_lock);
+      std::erase(_parked, &waiter);
+    }
+  }
+  if (_reader == Reader::nobody) passOnReading();
+  if (--_inside == 0 && _closing) _left.notifyAll();
+  return std::move(waiter.answer);
+}
+
+veltra_status DaemonConnection::enqueue(std::string frame, const Call& call) {
+  if (!_out.empty()) writeWaiting();  // the thread may be inside a callback
+  if (_ended || _closing || !_writable) {
+    ++_counts.dropped;
+    return VELTRA_NO_DAEMON;
+  }
+  if (!_out.empty() && _out.bytes() + frame.size() > _queueBytes) {
+    ++_counts.dropped;
+    return VELTRA_QUEUE_FULL;
+  }
+  const bool answered = call.waiter || call.callback;
+  const std::uint32_t callID = answered ? freeCallID() : 0;
+  if (answered) setCallID(frame, callID);
+  switch (_out.write(_socket.get(), std::move(frame))) {
+    case OutFrames::Wrote::gone:
+      ++_counts.dropped;
+      stopWriting();
+      return VELTRA_NO_DAEMON;
+    case OutFrames::Wrote::all:
+    case OutFrames::Wrote::some:
+      break;
+  }
+  if (answered) _calls.emplace(callID, call);
+  if (call.callback) ++_callbacks;
+  updateInterest();
+  return VELTRA_OK;
+}
+
+std::uint32_t DaemonConnection::freeCallID() {
+  do {
+    ++_lastCallID;
+  } while (_lastCallID == 0 || _calls.contains(_lastCallID));
+  return _lastCallID;
+}
+
+void DaemonConnection::writeWaiting() {
+  if (_writable && _out.writeWaiting(_socket.get()) == OutFrames::Wrote::gone) stopWriting();
+  updateInterest();
+}
+
+// Answers that came before the daemon went are still to be read; the end of the connection follows them.
+void DaemonConnection::stopWriting() {
+  _writable = false;
+  const std::uint64_t lost = _out.clear();
+  _counts.dropped += lost;
+  _lost += lost;
+}
+
+// ---- Answers in ----
+
+void DaemonConnection::waitForSocket(short events, int milliseconds) {
+  pollfd watched{_socket.get(), events, 0};
+  ::poll(&watched, 1, milliseconds);
+}
+
+DaemonConnection::Received DaemonConnection::receive(int flags) {
+  const auto [bytes, room] = _frames.room(kReadBytes);
+  const ssize_t count = ::recv(_socket.get(), bytes, room, flags);
+  if (count < 0 && (errno == EAGAIN || errno == EINTR)) return Received::nothing;
+  if (count <= 0) return Received::end;
+  _frames.received(static_cast<std::size_t>(count));
+  return takeFrames() ? Received::something : Received::end;
+}
+
+bool DaemonConnection::takeFrames() {
+  ipc::Frame frame;
+  for (;;) {
+    switch (_frames.next(frame)) {
+      case ipc::FrameReader::Next::needMore:
+        return true;
+      case ipc::FrameReader::Next::impossible:
+        return false;
+      case ipc::FrameReader::Next::frame:
+        break;
+    }
+    if (frame.header.kind == ipc::FrameKind::refusal) return false;
+    if (frame.header.kind == ipc::FrameKind::reply && frame.header.callID != 0) {
+      _arrived.push_back({frame.header.callID, answerOfReply(frame.body), {}});
+    } else if (frame.header.kind == ipc::FrameKind::event && _handler) {
+      auto body = parseBinaryPropertyList(frame.body);
+      const Dictionary* event = body ? body.value().asDictionary() : nullptr;
+      if (event) _arrived.push_back({0, nullptr, *event});
+    }
+  }
+}
+
+void DaemonConnection::readAsWaiter(const Waiter& waiter) {
+  _reader = Reader::waiter;
+  updateInterest();
+  while (!waiter.answer) {
+    // With calls still to be written, this one's may be among them, and the thread may be inside a callback.
+    const bool writing = !_out.empty();
+    _lock.unlock();
+    if (writing) waitForSocket(POLLIN | POLLOUT);
+    const Received received = receive(writing ? MSG_DONTWAIT : 0);
+    _lock.lock();
+    deliver();
+    if (received == Received::end) end();
+    if (writing) writeWaiting();
+  }
+  _reader = Reader::nobody;
+}
+
+void DaemonConnection::readAsOwnThread() {
+  _reader = Reader::ownThread;
+  Received received;
+  do {
+    _lock.unlock();
+    received = receive(MSG_DONTWAIT);
+    _lock.lock();
+    deliver();
+  } while (_hungUp && received == Received::something);
+  if (_hungUp || received == Received::end) end();
+  passOnReading();
+}
+
+void DaemonConnection::passOnReading() {
+  _reader = Reader::nobody;
+  if (_ended) return;
+  if (!_parked.empty()) {
+    _parked.front()->changed.notifyOne();
+  } else if (_hungUp) {
+    wake();
+  } else {
+    updateInterest();
+  }
+}
+
+void DaemonConnection::deliver() {
+  for (Arrived& arrived : _arrived) {
+    if (arrived.callID == 0) {
+      makeReady({nullptr, nullptr, nullptr, std::move(arrived.event)});
+      continue;
+    }
+    const auto at = _calls.find(arrived.callID);
+    if (at == _calls.end()) continue;
+    const Call call = at->second;
+    _calls.erase(at);
+    if (call.callback) --_callbacks;
+    finish(call, std::move(arrived.answer));
+  }
+  _arrived.clear();
+}
+
+void DaemonConnection::finish(const Call& call, Answer answer) {
+  ++(answer->status == VELTRA_NO_REPLY ? _counts.unanswered : _counts.replies);
+  if (call.waiter) {
+    call.waiter->answer = std::move(answer);
+    call.waiter->changed.notifyOne();
+  } else {
+    makeReady({call.callback, call.context, std::move(answer), {}});
+  }
+}
+
+void DaemonConnection::makeReady(Ready item) {
+  if (!item.callback) {
+    if (_readyEvents == kMostWaitingEvents) {
+      ++_counts.dropped_events;
+      return;
+    }
+    ++_readyEvents;
+  }
+  if (_ready.empty() && !onOwnThread()) wake();
+  _ready.push_back(std::move(item));
+}
+
+// ---- The end ----
+
+void DaemonConnection::end() {
+  if (_ended) return;
+  _ended = true;
+  stopWriting();
+  unwatch();
+  std::vector<std::pair<std::uint32_t, Call>> open(_calls.begin(), _calls.end());
+  _calls.clear();
+  _callbacks = 0;
+  std::sort(open.begin(), open.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
+  for (const auto& [callID, call] : open) finish(call, answerOfStatus(VELTRA_NO_REPLY, kConnectionEnded));
+}
+
+std::uint64_t DaemonConnection::close() {
+  using std::chrono::steady_clock;
+  const auto deadline = steady_clock::now() + kClosingTimeout;
+  {
+    Lock lock(_lock);
+    _closing = true;
+    while (!_out.empty() && steady_clock::now() < deadline) {
+      const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - steady_clock::now());
+      _lock.unlock();
+      waitForSocket(POLLOUT, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
+      _lock.lock();
+      writeWaiting();
+    }
+    end();
+    ::shutdown(_socket.get(), SHUT_RDWR);  // a thread that reads comes back
+    while (_inside > 0) _left.wait(_lock);
+    _stopping = true;
+    wake();
+  }
+  _thread.join();
+  Lock lock(_lock);
+  return _lost;
+}
+
+veltra_statistics DaemonConnection::statistics() {
+  Lock lock(_lock);
+  veltra_statistics counts = _counts;
+  counts.sent = _out.written();
+  counts.queued = _out.calls();
+  return counts;
+}
+
+// ---- The connection's thread ----
+
+void DaemonConnection::run() {
+  _ownThread.store(std::this_thread::get_id(), std::memory_order_relaxed);
+  const bool open = takeFrames();
+  {
+    Lock lock(_lock);
+    deliver();
+    if (!open) end();
+    passOnReading();
+  }
+  while (runReady()) {
+    epoll_event events[2];
+    const int count = ::epoll_wait(_epoll.get(), events, 2, -1);
+    std::uint32_t onSocket = 0;
+    for (int i = 0; i < count; ++i) {
+      if (events[i].data.fd == _socket.get()) {
+        onSocket = events[i].events;
+      } else {
+        eventfd_t wakes;
+        ::eventfd_read(_wakeUp.get(), &wakes);
+      }
+    }
+    serve(onSocket);
+  }
+}
+
+void DaemonConnection::serve(std::uint32_t events) {
+  Lock lock(_lock);
+  if (events & EPOLLOUT) writeWaiting();
+  if (events & kHangUps) {
+    _hungUp = true;
+    unwatch();  // or it would be reported without end while a waiting thread reads
+  }
+  if (((events & EPOLLIN) || _hungUp) && _reader == Reader::nobody && !_ended) readAsOwnThread();
+}
+
+// False when the thread is to end.
+bool DaemonConnection::runReady() {
+  std::deque<Ready> batch;
+  {
+    Lock lock(_lock);
+    batch.swap(_ready);
+    _readyEvents = 0;
+  }
+  for (Ready& item : batch) {
+    if (item.callback) {
+      item.callback(item.context, item.answer.get());
+    } else {
+      _handler(item.event);
+    }
+  }
+  Lock lock(_lock);
+  return !_stopping || !_ready.empty();
+}
+
+void DaemonConnection::wake() {
+  ::eventfd_write(_wakeUp.get(), 1);
+}
+
+void DaemonConnection::unwatch() {
+  if (std::exchange(_watched, false)) ::epoll_ctl(_epoll.get(), EPOLL_CTL_DEL, _socket.get(), nullptr);
+}
+
+// With nothing to be read but answers that a waiting thread fetches itself, the thread sleeps on.
+void DaemonConnection::updateInterest() {
+  if (!_watched) return;
+  std::uint32_t wanted = EPOLLRDHUP;
+  if (_reader != Reader::waiter && (_callbacks > 0 || _handler)) wanted |= EPOLLIN;
+  if (!_out.empty()) wanted |= EPOLLOUT;
+  if (std::exchange(_interest, wanted) == wanted) return;
+  epoll_event socketEvent{};
+  socketEvent.events = wanted;
+  socketEvent.data.fd = _socket.get();
+  ::epoll_ctl(_epoll.get(), EPOLL_CTL_MOD, _socket.get(), &socketEvent);
+}
+
+}  // namespace veltrad

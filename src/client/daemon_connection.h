@@ -1,0 +1,150 @@
+// The client's end of a connection: calls out, answers and events in. Any thread; callbacks on its own
+// thread.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <string>
+#include <thread>
+#include <unordered_map>
+#include <vector>
+
+#include "base/mutex.h"
+#include "base/value.h"
+#include "client/answer.h"
+#include "client/daemon_socket.h"
+#include "client/out_frames.h"
+#include "ipc/frame.h"
+#include "ipc/thread.h"
+#include "platform/file_descriptor.h"
+#include "veltra/veltra.h"
+
+namespace veltrad {
+
+// Events that may wait for a slow event handler; the next is dropped and counted.
+inline constexpr std::size_t kMostWaitingEvents = 4096;
+
+// Job: carries calls to the daemon in the order in which they were made and ends each exactly once.
+//
+// Whoever holds the reading role reads the socket, alone: a thread that waits for its own answer takes the
+// role when it is free, which makes such a call as fast as a bare exchange on the socket; otherwise the
+// connection's thread does. Both hand each answer to the thread that waits for it, or into the queue of
+// callbacks, which the connection's thread alone runs, under no lock.
+//
+// close() ends it; no other call may start after that.
+class DaemonConnection {
+ public:
+  // Gets an event's body on the connection's thread.
+  using EventHandler = std::function<void(const Dictionary&)>;
+
+  // Null when the system gives no descriptors or no thread; `error` says which. Without a handler events are
+  // dropped unread.
+  static std::unique_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
+                                                EventHandler handler, std::string& error);
+  ~DaemonConnection();
+  DaemonConnection(const DaemonConnection&) = delete;
+  DaemonConnection& operator=(const DaemonConnection&) = delete;
+
+  // `frame` is a call's, its call id still 0. Without a callback no answer is asked for.
+  veltra_status send(std::string frame, veltra_callback callback, void* context);
+  Answer sendAndWait(std::string frame);
+  bool onOwnThread() const {
+    return _ownThread.load(std::memory_order_relaxed) == std::this_thread::get_id();
+  }
+  veltra_statistics statistics();
+  // See veltra_session_close. Returns how many calls were accepted but never written.
+  std::uint64_t close();
+
+ private:
+  enum class Reader { nobody, waiter, ownThread };
+  enum class Received { something, nothing, end };
+
+  struct Waiter {
+    Condition changed;
+    Answer answer;
+  };
+  struct Call {
+    Waiter* waiter = nullptr;  // or else a callback
+    veltra_callback callback = nullptr;
+    void* context = nullptr;
+  };
+  // What came in with one read; an event when `callID` is 0.
+  struct Arrived {
+    std::uint32_t callID = 0;
+    Answer answer;
+    Dictionary event;
+  };
+  // What the connection's thread is to run; an event when there is no callback.
+  struct Ready {
+    veltra_callback callback = nullptr;
+    void* context = nullptr;
+    Answer answer;
+    Dictionary event;
+  };
+
+  DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, EventHandler handler);
+
+  // The connection's thread.
+  void run();
+  void serve(std::uint32_t events) EXCLUDES(_lock);
+  bool runReady() EXCLUDES(_lock);
+
+  // The holder of the reading role, without the lock.
+  Received receive(int flags);
+  bool takeFrames();  // false when nothing sensible can follow
+  void waitForSocket(short events, int milliseconds = -1);
+
+  veltra_status enqueue(std::string frame, const Call& call) REQUIRES(_lock);
+  std::uint32_t freeCallID() REQUIRES(_lock);
+  void readAsWaiter(const Waiter& waiter) REQUIRES(_lock);
+  void readAsOwnThread() REQUIRES(_lock);
+  void deliver() REQUIRES(_lock);
+  void finish(const Call& call, Answer answer) REQUIRES(_lock);
+  void makeReady(Ready item) REQUIRES(_lock);
+  void passOnReading() REQUIRES(_lock);
+  void writeWaiting() REQUIRES(_lock);
+  void stopWriting() REQUIRES(_lock);
+  void end() REQUIRES(_lock);
+  void updateInterest() REQUIRES(_lock);
+  void unwatch() REQUIRES(_lock);
+  void wake();
+
+  // Constant after construction.
+  const platform::FileDescriptor _socket;
+  platform::FileDescriptor _epoll;
+  platform::FileDescriptor _wakeUp;
+  const std::size_t _queueBytes;
+  const EventHandler _handler;
+  ipc::Thread _thread;
+  std::atomic<std::thread::id> _ownThread{};
+
+  // The holder of the reading role only.
+  ipc::FrameReader _frames;
+  std::vector<Arrived> _arrived;
+
+  Mutex _lock{LockRank::leaf};
+  Reader _reader GUARDED_BY(_lock) = Reader::ownThread;  // which first takes what came behind the hello
+  std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
+  std::size_t _inside GUARDED_BY(_lock) = 0;             // threads in sendAndWait
+  Condition _left GUARDED_BY(_lock);                     // _inside became 0
+  OutFrames _out GUARDED_BY(_lock);
+  std::unordered_map<std::uint32_t, Call> _calls GUARDED_BY(_lock);
+  std::size_t _callbacks GUARDED_BY(_lock) = 0;  // of _calls
+  std::uint32_t _lastCallID GUARDED_BY(_lock) = 0;
+  std::deque<Ready> _ready GUARDED_BY(_lock);
+  std::size_t _readyEvents GUARDED_BY(_lock) = 0;  // of _ready
+  std::uint32_t _interest GUARDED_BY(_lock) = 0;   // what epoll was last told
+  bool _watched GUARDED_BY(_lock) = true;
+  bool _hungUp GUARDED_BY(_lock) = false;  // the daemon has ended; what it sent before may still be unread
+  bool _writable GUARDED_BY(_lock) = true;
+  bool _ended GUARDED_BY(_lock) = false;
+  bool _closing GUARDED_BY(_lock) = false;
+  bool _stopping GUARDED_BY(_lock) = false;  // the thread ends once nothing is ready
+  std::uint64_t _lost GUARDED_BY(_lock) = 0;
+  veltra_statistics _counts GUARDED_BY(_lock){};
+};
+
+}  // namespace veltrad

@@ -1,0 +1,198 @@
+// Connecting and greeting; every way in which that fails has a line that says what to do.
+#include "client/daemon_socket.h"
+
+#include <fmt/format.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+
+#include <cerrno>
+#include <cstring>
+#include <system_error>
+
+#include "base/property_list.h"
+#include "base/text.h"
+#include "client/answer.h"
+
+namespace veltrad {
+
+namespace {
+
+using SteadyTime = std::chrono::steady_clock::time_point;
+
+std::string errorText(int number) {
+  return std::error_code(number, std::generic_category()).message();
+}
+
+ConnectFailure noDaemon(std::string text) {
+  return {VELTRA_NO_DAEMON, std::move(text)};
+}
+
+const char* kindOfFile(mode_t mode) {
+  if (S_ISDIR(mode)) return "a directory";
+  if (S_ISREG(mode)) return "a regular file";
+  return "no socket";
+}
+
+// A file of another kind at the socket's place looks to connect() like a socket that nobody serves.
+ConnectFailure refusedConnection(const std::string& shown, const std::string& path) {
+  struct stat facts {};
+  if (::stat(path.c_str(), &facts) == 0 && !S_ISSOCK(facts.st_mode)) {
+    return noDaemon(
+        fmt::format("{} is {}, not the daemon's socket: remove it and start veltrad, or name another "
+                    "root with VELTRA_ROOT or --root.",
+                    shown, kindOfFile(facts.st_mode)));
+  }
+  return noDaemon(fmt::format("The daemon that made {} has ended: start veltrad again.", shown));
+}
+
+ConnectFailure connectFailure(int error, const std::string& path) {
+  const std::string shown = escapedForLog(path);
+  switch (error) {
+    case ENOENT:
+      return noDaemon(fmt::format(
+          "No daemon listens on {}: start veltrad, or name its root with VELTRA_ROOT or --root.", shown));
+    case ECONNREFUSED:
+      return refusedConnection(shown, path);
+    case EACCES:
+      return noDaemon(
+          fmt::format("This user may not open {}: make its directories searchable and the socket "
+                      "writable for everyone.",
+                      shown));
+    case EPROTOTYPE:
+      return noDaemon(fmt::format(
+          "{} is a socket of another type, not the daemon's: remove it and start veltrad.", shown));
+    case EAGAIN:
+      return noDaemon(
+          fmt::format("The daemon on {} accepted no connection within {} s: see whether it is stuck or "
+                      "overloaded.",
+                      shown, kGreetingTimeout.count()));
+    default:
+      return noDaemon(fmt::format("Connecting to {} failed: {}.", shown, errorText(error)));
+  }
+}
+
+Result<platform::FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  if (path.size() >= sizeof address.sun_path) {
+    return Failure{ConnectFailure{
+        VELTRA_INVALID,
+        fmt::format(
+            "The root is too long: the socket's path {} has {} bytes, and at most {} are possible; name a "
+            "shorter root with VELTRA_ROOT or --root.",
+            escapedForLog(path), path.size(), sizeof address.sun_path - 1)}};
+  }
+  std::memcpy(address.sun_path, path.data(), path.size());
+  platform::FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (!made.isOpen()) return Failure{noDaemon(fmt::format("No socket could be made: {}.", errorText(errno)))};
+  // Bounds the wait for a place in the listener's backlog, and the writing of the first frames.
+  const timeval bound{kGreetingTimeout.count(), 0};
+  ::setsockopt(made.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
+  int failed;
+  do {
+    failed = ::connect(made.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+  } while (failed != 0 && errno == EINTR);
+  if (failed != 0) return Failure{connectFailure(errno, path)};
+  return made;
+}
+
+bool sendAll(int socket, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t count = ::send(socket, bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    if (count < 0 && errno == EINTR) continue;
+    if (count <= 0) return false;
+    bytes.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
+
+enum class Came { frame, end, timeout, impossible };
+
+Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, ipc::Frame& frame) {
+  for (;;) {
+    switch (daemon.reader.next(frame)) {
+      case ipc::FrameReader::Next::frame:
+        return Came::frame;
+      case ipc::FrameReader::Next::impossible:
+        return Came::impossible;
+      case ipc::FrameReader::Next::needMore:
+        break;
+    }
+    const auto left =
+        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+    if (left <= 0) return Came::timeout;
+    pollfd watched{daemon.socket.get(), POLLIN, 0};
+    if (::poll(&watched, 1, static_cast<int>(left)) <= 0) continue;  // the clock decides
+    const auto [bytes, room] = daemon.reader.room();
+    const ssize_t count = ::recv(daemon.socket.get(), bytes, room, MSG_DONTWAIT);
+    if (count > 0) daemon.reader.received(static_cast<std::size_t>(count));
+    if (count == 0 || (count < 0 && errno != EAGAIN && errno != EINTR)) return Came::end;
+  }
+}
+
+// Absent: the daemon's hello is as it must be.
+std::optional<ConnectFailure> verdictOnGreeting(const ipc::Frame& frame, const std::string& shown) {
+  const auto parsed = parseBinaryPropertyList(frame.body);
+  const Dictionary* body = parsed ? parsed.value().asDictionary() : nullptr;
+  if (frame.header.kind == ipc::FrameKind::refusal && body) {
+    const Dictionary* error = body->dictionary("error");
+    ReportingError refusal = error ? errorOfDictionary(*error) : ReportingError{};
+    if (refusal.description.empty()) {
+      refusal.description = fmt::format("The daemon on {} refused the connection and gave no reason.", shown);
+    }
+    return ConnectFailure{VELTRA_REFUSED, std::move(refusal.description)};
+  }
+  const auto wire = body ? body->uint32("wire") : std::nullopt;
+  if (frame.header.kind != ipc::FrameKind::hello || !wire) {
+    return noDaemon(
+        fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
+  }
+  if (*wire != ipc::kWireVersion) {
+    return ConnectFailure{
+        VELTRA_REFUSED,
+        fmt::format("The daemon on {} speaks version {} of the wire protocol and this library {}: "
+                    "install both from the same release.",
+                    shown, *wire, ipc::kWireVersion)};
+  }
+  return std::nullopt;
+}
+
+}  // namespace
+
+Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls) {
+  const auto deadline = std::chrono::steady_clock::now() + kGreetingTimeout;
+  auto connected = connectTo(path);
+  if (!connected) return Failure{connected.error()};
+  DaemonSocket daemon{std::move(connected).value(), {}};
+  const std::string hello =
+      ipc::makeFrame(ipc::FrameKind::hello, 0,
+                     Dictionary{{"wire", Value(ipc::kWireVersion)}, {"library", veltra_version()}});
+  // A daemon that refuses may end the connection before all of this is written; its reason is still to be
+  // read.
+  (void)sendAll(daemon.socket.get(), hello + firstCalls);
+  const std::string shown = escapedForLog(path);
+  ipc::Frame frame;
+  switch (receiveFrame(daemon, deadline, frame)) {
+    case Came::frame:
+      break;
+    case Came::timeout:
+      return Failure{
+          noDaemon(fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or "
+                               "overloaded.",
+                               shown, kGreetingTimeout.count()))};
+    case Came::end:
+      return Failure{
+          noDaemon(fmt::format("The daemon on {} ended the connection without a word: start veltrad "
+                               "again, or see its log.",
+                               shown))};
+    case Came::impossible:
+      return Failure{noDaemon(
+          fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown))};
+  }
+  if (auto failure = verdictOnGreeting(frame, shown)) return Failure{std::move(*failure)};
+  return daemon;
+}
+
+}  // namespace veltrad

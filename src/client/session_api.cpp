@@ -1,0 +1,188 @@
+// The C interface's functions on sessions. Any thread.
+#include <cstdlib>
+#include <cstring>
+
+#include "client/calls.h"
+#include "client/daemon_connection.h"
+#include "client/daemon_socket.h"
+#include "platform/root.h"
+
+using veltrad::Answer;
+using veltrad::CallFrame;
+using veltrad::Dictionary;
+
+struct veltra_session {
+  std::unique_ptr<veltrad::DaemonConnection> connection;
+};
+
+namespace {
+
+constexpr std::size_t kDefaultQueueBytes = 1u << 20;
+constexpr const char* kAggregatedOperation = "sendMessageToClient:timestamp:category:type:payload:";
+
+veltra_session* failed(veltra_status why, const std::string& text, veltra_status* status, char** error) {
+  if (status) *status = why;
+  if (error) *error = ::strdup(text.c_str());
+  return nullptr;
+}
+
+veltrad::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_callback callback,
+                                                           void* context) {
+  if (!callback) return nullptr;
+  return [callback, context](const Dictionary& event) {
+    const std::string* operation = event.string("op");
+    if (!operation || *operation != kAggregatedOperation) return;
+    const Dictionary* given = event.dictionary("args");
+    const Dictionary arguments = given ? *given : Dictionary{};
+    const Dictionary* sessionInfo = arguments.dictionary("sessionInfo");
+    const Dictionary* payload = arguments.dictionary("payload");
+    const auto infoNode = sessionInfo ? veltrad::nodeOfDictionary(*sessionInfo) : nullptr;
+    const auto payloadNode = payload ? veltrad::nodeOfDictionary(*payload) : nullptr;
+    callback(context, infoNode.get(), arguments.real("timestamp").value_or(0),
+             arguments.uint16("category").value_or(0), arguments.uint16("type").value_or(0),
+             payloadNode.get());
+  };
+}
+
+veltra_status send(veltra_session* session, CallFrame call, veltra_callback callback, void* context) {
+  if (!session) return VELTRA_INVALID;
+  if (call.status != VELTRA_OK) return call.status;
+  return session->connection->send(std::move(call.frame), callback, context);
+}
+
+veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply** reply) {
+  const veltra_status status = session ? call.status : VELTRA_INVALID;
+  Answer answer = status == VELTRA_OK ? session->connection->sendAndWait(std::move(call.frame))
+                                      : veltrad::answerOfStatus(status);
+  const veltra_status result = answer->status;
+  if (reply) *reply = answer.release();
+  return result;
+}
+
+}  // namespace
+
+void veltra_session_options_init(veltra_session_options* options) {
+  if (!options) return;
+  *options = veltra_session_options{};
+  options->size = sizeof *options;
+}
+
+veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
+                                      char** error) {
+  if (status) *status = VELTRA_OK;
+  if (error) *error = nullptr;
+  if (!options || options->size < sizeof *options) {
+    return failed(VELTRA_INVALID,
+                  "The session's options were not set up: call veltra_session_options_init first.", status,
+                  error);
+  }
+  const CallFrame description = veltrad::sessionInfoFrame(*options);
+  if (description.status != VELTRA_OK) {
+    return failed(description.status,
+                  description.status == VELTRA_TOO_LARGE
+                      ? "The user info is too large: with the session info it must fit into 1,048,576 bytes."
+                      : "The user info is no dictionary.",
+                  status, error);
+  }
+  const auto root = options->root && *options->root ? veltrad::platform::Root(options->root)
+                                                    : veltrad::platform::Root::fromEnvironment();
+  auto reached = veltrad::reachDaemon(root.socketPath(), description.frame);
+  if (!reached) return failed(reached.error().status, reached.error().text, status, error);
+  std::string text;
+  auto connection = veltrad::DaemonConnection::make(
+      std::move(reached).value(), options->queue_bytes ? options->queue_bytes : kDefaultQueueBytes,
+      aggregationHandler(options->aggregated, options->aggregated_context), text);
+  if (!connection) return failed(VELTRA_NO_DAEMON, text, status, error);
+  return new veltra_session{std::move(connection)};
+}
+
+void veltra_free(char* text) {
+  std::free(text);
+}
+
+veltra_status veltra_session_start(veltra_session* session, veltra_callback callback, void* context) {
+  return send(session, veltrad::callFrame(veltrad::kStartConfig), callback, context);
+}
+
+veltra_status veltra_session_start_wait(veltra_session* session, veltra_reply** reply) {
+  return sendAndWait(session, veltrad::callFrame(veltrad::kStartConfig), reply);
+}
+
+veltra_status veltra_session_send(veltra_session* session, uint16_t category, uint16_t type,
+                                  const veltra_value* payload, uint32_t flag, veltra_callback callback,
+                                  void* context) {
+  return send(session, veltrad::messageFrame(category, type, payload, flag), callback, context);
+}
+
+veltra_status veltra_session_send_wait(veltra_session* session, uint16_t category, uint16_t type,
+                                       const veltra_value* payload, uint32_t flag, veltra_reply** reply) {
+  return sendAndWait(session, veltrad::messageFrame(category, type, payload, flag), reply);
+}
+
+veltra_status veltra_session_send_dictionary(veltra_session* session, const veltra_value* message,
+                                             veltra_callback callback, void* context) {
+  return send(
+      session,
+      veltrad::dictionaryFrame(veltrad::kSendDictionary, "message", message, veltrad::Missing::invalid),
+      callback, context);
+}
+
+veltra_status veltra_session_send_dictionary_wait(veltra_session* session, const veltra_value* message,
+                                                  veltra_reply** reply) {
+  return sendAndWait(
+      session,
+      veltrad::dictionaryFrame(veltrad::kSendDictionary, "message", message, veltrad::Missing::invalid),
+      reply);
+}
+
+veltra_status veltra_session_flush(veltra_session* session, veltra_callback callback, void* context) {
+  return send(session, veltrad::callFrame(veltrad::kFlushMessages), callback, context);
+}
+
+veltra_status veltra_session_flush_wait(veltra_session* session, veltra_reply** reply) {
+  return sendAndWait(session, veltrad::callFrame(veltrad::kFlushMessages), reply);
+}
+
+veltra_status veltra_session_states(veltra_session* session, const veltra_value* user_info,
+                                    veltra_callback callback, void* context) {
+  return send(
+      session,
+      veltrad::dictionaryFrame(veltrad::kFetchStates, "userInfo", user_info, veltrad::Missing::allowed),
+      callback, context);
+}
+
+veltra_status veltra_session_states_wait(veltra_session* session, const veltra_value* user_info,
+                                         veltra_reply** reply) {
+  return sendAndWait(
+      session,
+      veltrad::dictionaryFrame(veltrad::kFetchStates, "userInfo", user_info, veltrad::Missing::allowed),
+      reply);
+}
+
+veltra_status veltra_session_display_url(veltra_session* session, veltra_callback callback, void* context) {
+  return send(session, veltrad::callFrame(veltrad::kFetchDisplayURL), callback, context);
+}
+
+veltra_status veltra_session_display_url_wait(veltra_session* session, veltra_reply** reply) {
+  return sendAndWait(session, veltrad::callFrame(veltrad::kFetchDisplayURL), reply);
+}
+
+veltra_status veltra_session_finish(veltra_session* session, veltra_callback callback, void* context) {
+  return send(session, veltrad::callFrame(veltrad::kFinishSession), callback, context);
+}
+
+veltra_status veltra_session_finish_wait(veltra_session* session, veltra_reply** reply) {
+  return sendAndWait(session, veltrad::callFrame(veltrad::kFinishSession), reply);
+}
+
+void veltra_session_statistics(veltra_session* session, veltra_statistics* statistics) {
+  if (!statistics) return;
+  *statistics = session ? session->connection->statistics() : veltra_statistics{};
+}
+
+uint64_t veltra_session_close(veltra_session* session) {
+  if (!session || session->connection->onOwnThread()) return 0;
+  const uint64_t lost = session->connection->close();
+  delete session;
+  return lost;
+}
