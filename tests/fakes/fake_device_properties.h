@@ -10,7 +10,7 @@
 
 #include "platform/device_properties.h"
 
-namespace veltrad::fakes {
+namespace veltrad::inline fakes {
 
 class FakeDeviceProperties final : public platform::DeviceProperties {
  public:
@@ -45,4 +45,4 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
   };
 };
 
-}  // namespace veltrad::fakes
+}  // namespace veltrad::inline fakes

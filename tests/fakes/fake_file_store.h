@@ -10,7 +10,7 @@
 
 #include "platform/file_store.h"
 
-namespace veltrad::fakes {
+namespace veltrad::inline fakes {
 
 class FakeFileStore final : public platform::FileStore {
  public:
@@ -131,4 +131,4 @@ class FakeFileStore final : public platform::FileStore {
   std::uint64_t _lastStamp = 0;
 };
 
-}  // namespace veltrad::fakes
+}  // namespace veltrad::inline fakes

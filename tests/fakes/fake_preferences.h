@@ -10,7 +10,7 @@
 
 #include "platform/preferences.h"
 
-namespace veltrad::fakes {
+namespace veltrad::inline fakes {
 
 class FakePreferences final : public platform::Preferences {
  public:
@@ -61,4 +61,4 @@ class FakePreferences final : public platform::Preferences {
   bool _refusesWrites = false;
 };
 
-}  // namespace veltrad::fakes
+}  // namespace veltrad::inline fakes

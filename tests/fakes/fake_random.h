@@ -7,7 +7,7 @@
 
 #include "platform/random.h"
 
-namespace veltrad::fakes {
+namespace veltrad::inline fakes {
 
 class FakeRandom final : public platform::Random {
  public:
@@ -37,4 +37,4 @@ class FakeRandom final : public platform::Random {
   int _drawn = 0;
 };
 
-}  // namespace veltrad::fakes
+}  // namespace veltrad::inline fakes

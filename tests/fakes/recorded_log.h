@@ -14,7 +14,7 @@
 
 #include "platform/log.h"
 
-namespace veltrad::fakes {
+namespace veltrad::inline fakes {
 
 // Everything is kept, debug lines included. Verdict in the destructor: every expected line came, and every
 // warning or error was expected.
@@ -101,4 +101,4 @@ class RecordedLog {
   std::vector<Line> _expected;
 };
 
-}  // namespace veltrad::fakes
+}  // namespace veltrad::inline fakes

@@ -1,0 +1,188 @@
+// What the device and the locale say of themselves.
+#include <fmt/format.h>
+#include <gtest/gtest.h>
+#include <openssl/evp.h>
+#include <time.h>
+
+#include <cstdlib>
+
+#include "base/property_list.h"
+#include "fakes/fake_file_store.h"
+#include "fakes/recorded_log.h"
+#include "platform/device_properties.h"
+#include "platform/locale.h"
+
+namespace veltrad::platform {
+namespace {
+
+using Text = std::optional<std::string>;
+constexpr const char* kList = "/root/etc/veltrad/device.plist";
+
+class MachinePropertiesTest : public ::testing::Test {
+ protected:
+  void put(const Dictionary& list) { _files.put(kList, writeXMLPropertyList(list)); }
+
+  fakes::RecordedLog _log;
+  fakes::FakeFileStore _files;
+  MachineProperties _properties{_files, kList};
+};
+
+TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
+  _files.put("/etc/os-release", "NAME=x\nVERSION_ID=\"12\"\nBUILD_ID='2026.1'\n");
+  EXPECT_EQ(_properties.value("ProductVersion"), "12");
+  EXPECT_EQ(_properties.value("BuildVersion"), "2026.1");
+  put({{"ProductVersion", "17.4"}, {"BuildVersion", ""}, {"ReleaseType", "Internal"}, {"DeviceName", 5}});
+  EXPECT_EQ(_properties.value("ProductVersion"), "17.4");
+  EXPECT_EQ(_properties.value("BuildVersion"), Text());
+  EXPECT_EQ(_properties.value("ReleaseType"), "Internal");
+  EXPECT_EQ(_properties.value("DeviceName"), "Computer");  // no text: as if the key were absent
+  put({{"BuildVersion", "B"}});
+  EXPECT_EQ(_properties.value("BuildVersion"), "B");
+  EXPECT_EQ(_properties.value("ReleaseType"), Text());
+}
+
+TEST_F(MachinePropertiesTest, AMalformedListIsOneLineAChangeAndTheMachineIsAsked) {
+  _files.put("/etc/os-release", "VERSION_ID=12\n");
+  for (const char* bytes : {"rubbish", "other rubbish"}) {
+    _files.put(kList, bytes);
+    _log.expectLine(LogLevel::error,
+                    "Device properties could not be read, the machine is asked: " + std::string(kList));
+    EXPECT_EQ(_properties.value("ProductVersion"), "12");
+    EXPECT_EQ(_properties.value("ProductVersion"), "12");
+  }
+}
+
+TEST_F(MachinePropertiesTest, AMachineThatSaysNothingHasANameClassAlone) {
+  for (const char* key : {"ProductVersion", "BuildVersion", "ProductType", "HWModelStr", "SerialNumber",
+                          "UniqueDeviceID", "ReleaseType", "unheard of"}) {
+    EXPECT_EQ(_properties.value(key), Text()) << key;
+  }
+  EXPECT_EQ(_properties.value("DeviceName"), "Computer");
+}
+
+TEST_F(MachinePropertiesTest, AsksDMIThenTheDeviceTree) {
+  _files.put("/usr/lib/os-release", "VERSION_ID=13\n");
+  _files.put("/proc/sys/kernel/osrelease", "6.1.0-18\n");
+  _files.put("/proc/device-tree/model", std::string_view("Board Model B\0", 14));
+  EXPECT_EQ(_properties.value("ProductVersion"), "13");
+  EXPECT_EQ(_properties.value("BuildVersion"), "6.1.0-18");
+  EXPECT_EQ(_properties.value("ProductType"), "Board Model B");
+  EXPECT_EQ(_properties.value("DeviceName"), "Embedded");
+  _files.put("/sys/class/dmi/id/product_name", "Workbench 3 \n");
+  _files.put("/sys/class/dmi/id/board_name", "WB3-B\n");
+  _files.put("/sys/class/dmi/id/product_serial", " \n");
+  _files.put("/sys/class/dmi/id/chassis_type", "10\n");
+  EXPECT_EQ(_properties.value("ProductType"), "Workbench 3");
+  EXPECT_EQ(_properties.value("HWModelStr"), "WB3-B");
+  EXPECT_EQ(_properties.value("SerialNumber"), Text());
+  EXPECT_EQ(_properties.value("DeviceName"), "Laptop");
+}
+
+TEST_F(MachinePropertiesTest, NamesTheClassOfTheDevice) {
+  _files.put("/sys/class/dmi/id/chassis_type", "3\n");
+  EXPECT_EQ(_properties.value("DeviceName"), "Desktop");
+  _files.put("/proc/cpuinfo", "processor : 0\nflags\t\t: fpu hypervisor\nbugs\t:\n");
+  EXPECT_EQ(_properties.value("DeviceName"), "VM");
+  _files.put("/proc/cpuinfo", "processor : 0\nflags\t\t: fpu\nbugs\t: hypervisor\n");
+  EXPECT_EQ(_properties.value("DeviceName"), "Desktop");
+  _files.put("/sys/class/dmi/id/sys_vendor", "QEMU\n");
+  EXPECT_EQ(_properties.value("DeviceName"), "VM");
+  _files.put("/run/systemd/container", "");
+  EXPECT_EQ(_properties.value("DeviceName"), "Container");
+  _files.put("/etc/machine-info", "CHASSIS=tablet\n");
+  EXPECT_EQ(_properties.value("DeviceName"), "Tablet");
+}
+
+TEST(MachineFacts, KnowsChassisTypes) {
+  const std::pair<int, Text> cases[] = {{0, {}},         {1, {}},          {2, {}},
+                                        {3, "Desktop"},  {9, "Laptop"},    {11, "Handset"},
+                                        {17, "Server"},  {23, "Server"},   {30, "Tablet"},
+                                        {31, "Laptop"},  {34, "Embedded"}, {3 | 0x80, "Desktop"},
+                                        {35, "Desktop"}, {99, {}}};
+  for (const auto& [type, name] : cases) EXPECT_EQ(deviceNameOfChassisType(type), name) << type;
+}
+
+TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChanges) {
+  const std::string id = "3d1219c7c4c5404aaa1f6d2a48adfda4";
+  _files.put("/etc/machine-id", id + "\n");
+  const auto device = _properties.value("UniqueDeviceID");
+  ASSERT_TRUE(device);
+  EXPECT_EQ(device->size(), 40u);
+  EXPECT_EQ(device->find_first_not_of("0123456789abcdef"), std::string::npos);
+  EXPECT_EQ(_properties.value("UniqueDeviceID"), device);
+
+  // Not what any other program that hashes the bare machine id would make of it.
+  unsigned char digest[32];
+  EVP_Digest(id.data(), id.size(), digest, nullptr, EVP_sha256(), nullptr);
+  std::string bare;
+  for (int i = 0; i < 20; ++i) bare += fmt::format("{:02x}", digest[i]);
+  EXPECT_NE(device, bare);
+
+  _files.put("/etc/machine-id", "4d1219c7c4c5404aaa1f6d2a48adfda4\n");
+  EXPECT_NE(_properties.value("UniqueDeviceID"), device);
+  _files.put("/etc/machine-id", "uninitialized\n");
+  EXPECT_EQ(_properties.value("UniqueDeviceID"), Text());
+}
+
+TEST(Locale, FindsTheCountryInALocaleName) {
+  const std::pair<const char*, Text> cases[] = {
+      {"de_DE.UTF-8", "DE"},
+      {"de_DE", "DE"},
+      {"de_DE@euro", "DE"},
+      {"ca_ES.UTF-8@valencia", "ES"},
+      {"es_419", "419"},
+      {"en_gb", "GB"},
+      {"C", {}},
+      {"POSIX", {}},
+      {"C.UTF-8", {}},
+      {"eo", {}},
+      {"eo.UTF-8", {}},
+      {"_DE", {}},
+      {"de_", {}},
+      {"de_DEU", {}},
+      {"de_D1", {}},
+      {"C.x_DE", {}},
+      {"", {}},
+      {"de_\xc3\x9c", {}},
+  };
+  for (const auto& [name, country] : cases) EXPECT_EQ(countryOfLocaleName(name), country) << name;
+}
+
+class EnvironmentLocaleTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    for (const char* variable : {"LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(variable);
+  }
+  void TearDown() override {
+    SetUp();
+    ::unsetenv("TZ");
+    ::tzset();
+  }
+  fakes::FakeFileStore _files;
+  EnvironmentLocale _locale{_files, "/root/etc/locale.conf"};
+};
+
+TEST_F(EnvironmentLocaleTest, TakesTheFirstVariableThatIsSetAndNotEmpty) {
+  EXPECT_EQ(_locale.countryCode(), Text());
+  _files.put("/root/etc/locale.conf", "# comment\nLANG=\"fr_CA.UTF-8\"\nLC_TIME=de_DE.UTF-8\n");
+  EXPECT_EQ(_locale.countryCode(), "CA");
+  ::setenv("LANG", "pt_BR.UTF-8", 1);
+  EXPECT_EQ(_locale.countryCode(), "BR");
+  ::setenv("LC_MESSAGES", "C", 1);  // set, and without a country: what follows is not asked
+  EXPECT_EQ(_locale.countryCode(), Text());
+  ::setenv("LC_ALL", "de_AT", 1);
+  EXPECT_EQ(_locale.countryCode(), "AT");
+  ::setenv("LC_ALL", "", 1);
+  ::setenv("LC_MESSAGES", "", 1);
+  EXPECT_EQ(_locale.countryCode(), "BR");
+}
+
+TEST_F(EnvironmentLocaleTest, SeesAChangedZone) {
+  ::setenv("TZ", "XXX-5:30", 1);
+  EXPECT_EQ(_locale.timeZoneOffset(), 5 * 3'600 + 1'800);
+  ::setenv("TZ", "YYY+8", 1);
+  EXPECT_EQ(_locale.timeZoneOffset(), -8 * 3'600);
+}
+
+}  // namespace
+}  // namespace veltrad::platform

@@ -1,0 +1,193 @@
+// Who a peer is, and what the rules let it do.
+#include "platform/entitlements.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include "base/property_list.h"
+#include "fakes/fake_file_store.h"
+#include "fakes/recorded_log.h"
+#include "fakes/temporary_directory.h"
+#include "platform/child_process.h"
+#include "platform/peer.h"
+
+namespace veltrad::platform {
+namespace {
+
+constexpr const char* kName = "com.florn.private.veltrad";
+constexpr const char* kPath = "/etc/veltrad/entitlements.plist";
+
+Dictionary rule(Dictionary conditions, Value granted = true) {
+  conditions.set("entitlements", Dictionary{{kName, granted}});
+  return conditions;
+}
+
+TEST(EntitlementRules, MatchWhatTheKernelSaidOfThePeer) {
+  const Peer peer{1'000, {100, 27, 4}, 42, "agent.service"};
+  const Peer unitless{1'000, {100}, 42, {}};
+  struct Case {
+    const char* what;
+    Array rules;
+    bool peerGets;
+    bool unitlessGets;
+  };
+  const Case cases[] = {
+      {"no rules", {}, false, false},
+      {"uid", {rule({{"uid", 1'000}})}, true, true},
+      {"another uid", {rule({{"uid", 1'001}})}, false, false},
+      {"effective gid", {rule({{"gid", 100}})}, true, true},
+      {"supplementary gid", {rule({{"gid", 4u}})}, true, false},
+      {"unit", {rule({{"unit", "agent.service"}})}, true, false},
+      {"another unit", {rule({{"unit", "agent"}})}, false, false},
+      {"an empty unit", {rule({{"unit", ""}})}, false, false},
+      {"all of three", {rule({{"uid", 1'000}, {"gid", 27}, {"unit", "agent.service"}})}, true, false},
+      {"all but one", {rule({{"uid", 1'000}, {"gid", 28}})}, false, false},
+      {"no condition", {rule({})}, false, false},
+      {"the second rule", {rule({{"uid", 0}}), rule({{"uid", 1'000}})}, true, true},
+      {"a uid that is a text", {rule({{"uid", "1000"}})}, false, false},
+      {"a uid that is a real", {rule({{"uid", 1'000.0}})}, false, false},
+      {"a uid of the wrong type is not absent", {rule({{"uid", "0"}, {"gid", 100}})}, false, false},
+      {"a unit of the wrong type is not absent", {rule({{"uid", 1'000}, {"unit", 1}})}, false, false},
+      {"a uid that would have to wrap", {rule({{"uid", (1LL << 32) + 1'000}})}, false, false},
+      {"no dictionary", {"uid", rule({{"uid", 1'000}})}, true, true},
+      {"another name", {Dictionary{{"uid", 1'000}, {"entitlements", Dictionary{{"x", true}}}}}, false, false},
+      {"another name first",
+       {Dictionary{{"uid", 1'000}, {"entitlements", Dictionary{{"x", true}}}}, rule({{"gid", 100}})},
+       true,
+       true},
+  };
+  for (const Case& c : cases) {
+    EXPECT_EQ(entitlementInRules(c.rules, kName, peer).has_value(), c.peerGets) << c.what;
+    EXPECT_EQ(entitlementInRules(c.rules, kName, unitless).has_value(), c.unitlessGets) << c.what;
+  }
+}
+
+TEST(EntitlementRules, TheFirstRuleThatNamesItDecides) {
+  const Peer peer{1'000, {100}, 42, {}};
+  const Array rules{rule({{"uid", 1'000}}, false), rule({{"gid", 100}}, true)};
+  EXPECT_EQ(entitlementInRules(rules, kName, peer), Value(false));
+  EXPECT_EQ(entitlementInRules({rule({{"uid", 1'000}}, 1)}, kName, peer), Value(1));  // no boolean: no grant
+}
+
+TEST(EntitlementRules, AnOverflowedUserIdIsNobodysRule) {
+  EXPECT_FALSE(entitlementInRules({rule({{"uid", -1}})}, kName, Peer{0xffff'ffff, {0xffff'ffff}, 0, {}}));
+}
+
+class EntitlementsTest : public ::testing::Test {
+ protected:
+  std::optional<Value> granted() {
+    return _entitlements.valueForEntitlement(kName, Peer{1'000, {100}, 42, {}});
+  }
+  void put(const Array& rules) { _files.put(kPath, writeXMLPropertyList(rules)); }
+
+  fakes::RecordedLog _log;
+  fakes::FakeFileStore _files;
+  Entitlements _entitlements{_files, kPath};
+};
+
+TEST_F(EntitlementsTest, AreRereadWhenTheFileChanges) {
+  EXPECT_FALSE(granted());
+  put({rule({{"uid", 1'000}})});
+  EXPECT_EQ(granted(), Value(true));
+  put({rule({{"uid", 0}})});
+  EXPECT_FALSE(granted());
+  put({rule({{"uid", 1'000}})});
+  EXPECT_EQ(granted(), Value(true));
+  _files.remove(kPath);
+  EXPECT_FALSE(granted());
+}
+
+TEST_F(EntitlementsTest, AFileThatCannotBeReadGrantsNothingAndIsOneLineAChange) {
+  put({rule({{"uid", 1'000}})});
+  EXPECT_TRUE(granted());
+  for (const std::string& bytes : {std::string("rubbish"), writeXMLPropertyList(rule({{"uid", 1'000}}))}) {
+    _files.put(kPath, bytes);
+    _log.expectLine(LogLevel::error,
+                    "Entitlements could not be read, nothing is granted: " + std::string(kPath));
+    EXPECT_FALSE(granted());
+    EXPECT_FALSE(granted());
+  }
+  put({rule({{"uid", 1'000}})});
+  _files.failReads(kPath, FileFailure::Kind::noAccess);
+  _log.expectLine(LogLevel::error, "Permission denied");
+  EXPECT_FALSE(granted());
+  EXPECT_FALSE(granted());
+}
+
+TEST_F(EntitlementsTest, ARuleThatCanNeverMatchIsNamed) {
+  put({rule({{"uid", 1'000}}), rule({}), rule({{"gid", "wheel"}}), Dictionary{{"uid", 1}}, 5});
+  for (const char* text :
+       {"rule 1 grants nothing: expected \"uid\", \"gid\" or \"unit\"", "rule 2 grants nothing: \"gid\"",
+        "rule 3 grants nothing: expected a dictionary under \"entitlements\"",
+        "rule 4 grants nothing: expected a dictionary"}) {
+    _log.expectLine(LogLevel::warning, text);
+  }
+  EXPECT_EQ(granted(), Value(true));
+  EXPECT_EQ(granted(), Value(true));
+}
+
+TEST(SystemUnit, IsTheFirstBelowTheSlicesAndNeverAUsers) {
+  const std::pair<const char*, std::optional<std::string>> cases[] = {
+      {"/system.slice/x.service", "x.service"},
+      {"/system.slice/system-foo.slice/foo@1.service", "foo@1.service"},
+      {"/system.slice/x.service/system.slice/root.service", "x.service"},
+      {"/x.service", "x.service"},
+      {"/machine.slice/m.scope/payload", "m.scope"},
+      {"/user.slice/user-1000.slice/user@1000.service/app.slice/x.service", {}},
+      {"/user.slice/user-1000.slice/session-2.scope", {}},
+      {"/user.slice", {}},
+      {"/system.slice", {}},
+      {"/docker/x.service", {}},
+      {"/system.slice/sub/x.service", {}},
+      {"/../x.service", {}},
+      {"/system.slice/x.service (deleted)", {}},
+      {"/system.slice/.service", {}},
+      {"system.slice/x.service", {}},
+      {"/system.slice//x.service", {}},
+      {"/", {}},
+      {"", {}},
+  };
+  for (const auto& [path, unit] : cases) EXPECT_EQ(systemUnitOfControlGroup(path), unit) << path;
+}
+
+TEST(PeerOfSocket, SaysWhoConnected) {
+  int ends[2];
+  ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
+  const FileDescriptor one(ends[0]);
+  const FileDescriptor other(ends[1]);
+  const auto peer = peerOfSocket(one.get());
+  ASSERT_TRUE(peer);
+  EXPECT_EQ(peer.value().uid, ::geteuid());
+  EXPECT_EQ(peer.value().pid, ::getpid());
+  EXPECT_EQ(peer.value().gids.at(0), ::getegid());
+  std::vector<gid_t> groups(static_cast<std::size_t>(::getgroups(0, nullptr)));
+  ASSERT_EQ(::getgroups(static_cast<int>(groups.size()), groups.data()), static_cast<int>(groups.size()));
+  EXPECT_EQ(std::vector<unsigned>(peer.value().gids.begin() + 1, peer.value().gids.end()), groups);
+  EXPECT_FALSE(peerOfSocket(STDIN_FILENO));
+}
+
+TEST(PeerOfSocket, ADeadPeerHasNoUnit) {
+  fakes::TemporaryDirectory directory;
+  sockaddr_un address{AF_UNIX, {}};
+  directory.path("s").copy(address.sun_path, sizeof address.sun_path - 1);
+  const FileDescriptor listening(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  ASSERT_EQ(::bind(listening.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  ASSERT_EQ(::listen(listening.get(), 1), 0);
+  fakes::ChildProcess child([&](const auto&) {
+    const int socket = ::socket(AF_UNIX, SOCK_STREAM, 0);
+    return ::connect(socket, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0 ? 0 : 1;
+  });
+  const pid_t pid = child.pid();
+  ASSERT_EQ(child.wait(), 0);
+  const FileDescriptor accepted(::accept4(listening.get(), nullptr, nullptr, SOCK_CLOEXEC));
+  const auto peer = peerOfSocket(accepted.get());
+  ASSERT_TRUE(peer);
+  EXPECT_EQ(peer.value().uid, ::geteuid());
+  EXPECT_EQ(peer.value().pid, pid);
+  EXPECT_FALSE(peer.value().unit);
+}
+
+}  // namespace
+}  // namespace veltrad::platform

@@ -1,0 +1,124 @@
+// Files on a real disk: what a fault leaves behind.
+#include "platform/file_store.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+
+#include "fakes/temporary_directory.h"
+
+namespace veltrad::platform {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::EndsWith;
+using ::testing::HasSubstr;
+using ::testing::UnorderedElementsAre;
+using Kind = FileFailure::Kind;
+
+constexpr std::size_t kMost = 1u << 20;
+
+class DiskFileStoreTest : public ::testing::Test {
+ protected:
+  fakes::TemporaryDirectory _directory;
+  DiskFileStore _files;
+};
+
+TEST_F(DiskFileStoreTest, ReplacesWholeWithTheModeAskedForAndLeavesNothingElse) {
+  _directory.write("x", "old");
+  const mode_t before = ::umask(077);
+  ASSERT_FALSE(_files.replace(_directory.path("x"), std::string_view("a\0b", 3), 0644));
+  ::umask(before);
+  EXPECT_EQ(_files.read(_directory.path("x"), kMost).value(), std::string("a\0b", 3));
+  struct stat status {};
+  ASSERT_EQ(::stat(_directory.path("x").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0644u);
+  EXPECT_THAT(_directory.names(), ElementsAre("x"));
+}
+
+TEST_F(DiskFileStoreTest, AFullDiskLeavesTheOldFileAndNoNewOne) {
+  _directory.write("x", "old");
+  rlimit before{};
+  ::getrlimit(RLIMIT_FSIZE, &before);
+  const auto handler = ::signal(SIGXFSZ, SIG_IGN);
+  const rlimit small{4'096, before.rlim_max};
+  ::setrlimit(RLIMIT_FSIZE, &small);
+  const auto failure = _files.replace(_directory.path("x"), std::string(10'000, 'n'), 0600);
+  ::setrlimit(RLIMIT_FSIZE, &before);
+  ::signal(SIGXFSZ, handler);
+
+  ASSERT_TRUE(failure);
+  EXPECT_EQ(failure->kind, Kind::tooLarge);
+  EXPECT_EQ(_directory.read("x"), "old");
+  EXPECT_THAT(_directory.names(), ElementsAre("x"));
+}
+
+TEST_F(DiskFileStoreTest, ARenameThatFailsLeavesNoNewFile) {
+  std::filesystem::create_directory(_directory.path("x"));
+  const auto failure = _files.replace(_directory.path("x"), "new", 0600);
+  ASSERT_TRUE(failure);
+  EXPECT_THAT(failure->description, HasSubstr(_directory.path("x") + ": "));
+  EXPECT_THAT(_directory.names(), ElementsAre("x"));
+}
+
+TEST_F(DiskFileStoreTest, ReplacesALinkInsteadOfWritingThroughIt) {
+  _directory.write("elsewhere", "untouched");
+  std::filesystem::create_symlink("elsewhere", _directory.path("x"));
+  ASSERT_FALSE(_files.replace(_directory.path("x"), "new", 0600));
+  EXPECT_EQ(_directory.read("elsewhere"), "untouched");
+  EXPECT_FALSE(std::filesystem::is_symlink(_directory.path("x")));
+}
+
+TEST_F(DiskFileStoreTest, ReadsWithinItsBoundAndRegularFilesAlone) {
+  _directory.write("x", std::string(5'000, 'x'));
+  EXPECT_EQ(_files.read(_directory.path("x"), 5'000).value().size(), 5'000u);
+  EXPECT_EQ(_files.read(_directory.path("x"), 4'999).error().kind, Kind::tooLarge);
+
+  ASSERT_EQ(::mkfifo(_directory.path("pipe").c_str(), 0600), 0);
+  EXPECT_THAT(_files.read(_directory.path("pipe"), kMost).error().description,
+              EndsWith("not a regular file"));
+  EXPECT_EQ(_files.read(_directory.path(), kMost).error().kind, Kind::other);
+
+  const auto missing = _files.read(_directory.path("none"), kMost);
+  EXPECT_EQ(missing.error().kind, Kind::notFound);
+  EXPECT_EQ(missing.error().description, _directory.path("none") + ": No such file or directory");
+  EXPECT_EQ(_files.read(_directory.path("x/below"), kMost).error().kind, Kind::notFound);
+
+  // A size of 0 is no promise.
+  EXPECT_FALSE(_files.read("/proc/self/status", kMost).value().empty());
+  EXPECT_EQ(_files.read("/proc/self/status", 10).error().kind, Kind::tooLarge);
+}
+
+TEST_F(DiskFileStoreTest, TheStampChangesWithEveryKindOfChange) {
+  const std::string path = _directory.path("x");
+  EXPECT_FALSE(_files.stamp(path));
+  _directory.write("x", "1");
+  const auto first = _files.stamp(path);
+  ASSERT_TRUE(first);
+  EXPECT_EQ(_files.stamp(path), first);
+  ASSERT_FALSE(_files.replace(path, "1", 0600));
+  const auto second = _files.stamp(path);
+  EXPECT_NE(second, first);
+  _directory.write("x", "12");
+  EXPECT_NE(_files.stamp(path), second);
+  ASSERT_FALSE(_files.rename(path, path + ".corrupt"));
+  EXPECT_FALSE(_files.stamp(path));
+  EXPECT_EQ(_directory.read("x.corrupt"), "12");
+}
+
+TEST_F(DiskFileStoreTest, MakesDirectoriesAndSaysWhatIsInTheWay) {
+  EXPECT_FALSE(makeDirectories(_directory.path("a/b/c")));
+  EXPECT_FALSE(makeDirectories(_directory.path("a/b/c")));
+  EXPECT_TRUE(std::filesystem::is_directory(_directory.path("a/b/c")));
+  _directory.write("file", "");
+  for (const char* below : {"file", "file/x"}) {
+    const auto failure = makeDirectories(_directory.path(below));
+    ASSERT_TRUE(failure) << below;
+    EXPECT_THAT(failure->description, HasSubstr("Not a directory")) << below;
+  }
+}
+
+}  // namespace
+}  // namespace veltrad::platform

@@ -1,0 +1,133 @@
+// Preference domains over real files and over a disk with faults.
+#include "platform/preferences.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <set>
+#include <thread>
+
+#include "base/property_list.h"
+#include "fakes/fake_file_store.h"
+#include "fakes/recorded_log.h"
+#include "fakes/temporary_directory.h"
+#include "platform/uuid.h"
+
+namespace veltrad::platform {
+namespace {
+
+using Level = LogLevel;
+using Kind = FileFailure::Kind;
+
+constexpr std::string_view kDomain = kVeltraPreferenceDomain;
+constexpr const char* kPath = "/preferences/com.florn.veltra.plist";
+
+class FilePreferencesTest : public ::testing::Test {
+ protected:
+  void put(const Dictionary& all) { _files.put(kPath, writeBinaryPropertyList(all)); }
+
+  fakes::RecordedLog _log;
+  fakes::FakeFileStore _files;
+  FilePreferences _preferences{_files, "/preferences"};
+};
+
+TEST_F(FilePreferencesTest, ReadsBothFormsAtUseAndGivesDecimalTexts) {
+  EXPECT_FALSE(_preferences.value(kDomain, "text"));
+  const Dictionary all{{"text", "t"},  {"number", 17}, {"flag", true},
+                       {"off", false}, {"real", 1.5},  {"list", Array{1}}};
+  for (const std::string& bytes : {writeBinaryPropertyList(all), writeXMLPropertyList(all)}) {
+    _files.put(kPath, bytes);
+    EXPECT_EQ(_preferences.text(kDomain, "text"), "t");
+    EXPECT_EQ(_preferences.text(kDomain, "number"), "17");
+    EXPECT_EQ(_preferences.text(kDomain, "flag"), "1");
+    EXPECT_EQ(_preferences.text(kDomain, "off"), "0");
+    EXPECT_EQ(_preferences.text(kDomain, "real"), "1.5");
+    EXPECT_FALSE(_preferences.text(kDomain, "list"));
+    EXPECT_EQ(_preferences.value(kDomain, "number")->toInt64(), 17);
+  }
+  put({{"text", "changed"}});
+  EXPECT_EQ(_preferences.text(kDomain, "text"), "changed");
+}
+
+TEST_F(FilePreferencesTest, StoresInTheBinaryFormBesideWhatIsThere) {
+  _files.put(kPath, writeXMLPropertyList(Dictionary{{"kept", 1}}));
+  EXPECT_TRUE(_preferences.setValue(kDomain, "new", "n"));
+  EXPECT_EQ(_files.bytes(kPath)->substr(0, 8), "bplist00");
+  EXPECT_EQ(_files.mode(kPath), 0600u);
+  EXPECT_EQ(_preferences.text(kDomain, "kept"), "1");
+  EXPECT_EQ(_preferences.text(kDomain, "new"), "n");
+}
+
+TEST_F(FilePreferencesTest, PutsAMalformedFileAsideWithOneLineAndGoesOn) {
+  for (const std::string& bytes :
+       {std::string("bplist00rubbish"), std::string(""), writeBinaryPropertyList(Array{1})}) {
+    _files.put(kPath, bytes);
+    _log.expectLine(Level::error, "kept as /preferences/com.florn.veltra.plist.corrupt");
+    EXPECT_FALSE(_preferences.value(kDomain, "a"));
+    EXPECT_FALSE(_preferences.value(kDomain, "a"));
+    EXPECT_EQ(_files.bytes(std::string(kPath) + ".corrupt"), bytes);
+    EXPECT_TRUE(_preferences.setValue(kDomain, "a", 1));
+    EXPECT_EQ(_preferences.text(kDomain, "a"), "1");
+  }
+}
+
+TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {
+  put({{"kept", 1}});
+  _files.failReads(kPath, Kind::other);
+  _log.expectLine(Level::error, "Preferences could not be read, defaults serve: /preferences/");
+  _log.expectLine(Level::error, "Preference not stored, its file cannot be read: /preferences/");
+  EXPECT_FALSE(_preferences.value(kDomain, "kept"));
+  EXPECT_FALSE(_preferences.setValue(kDomain, "new", 1));
+  _files.failReads(kPath, {});
+  EXPECT_EQ(_preferences.text(kDomain, "kept"), "1");
+}
+
+TEST_F(FilePreferencesTest, AMalformedFileThatCannotBePutAsideIsOneLineAndStays) {
+  _files.put(kPath, "rubbish");
+  _files.failWrites(Kind::noAccess);
+  _log.expectLine(Level::error, "; not renamed, /preferences/");
+  EXPECT_FALSE(_preferences.value(kDomain, "a"));
+  EXPECT_FALSE(_preferences.value(kDomain, "a"));
+  EXPECT_EQ(_files.bytes(kPath), "rubbish");
+}
+
+TEST_F(FilePreferencesTest, ATextIsMadeOnceAndFoundAfterARestart) {
+  put({{"empty", ""}});
+  const std::string made = _preferences.textOrStore(kDomain, "id", randomUUIDText);
+  EXPECT_EQ(made.size(), 36u);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "id", randomUUIDText), made);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", randomUUIDText).size(), 36u);
+  _files.crash();
+  FilePreferences restarted(_files, "/preferences");
+  EXPECT_EQ(restarted.textOrStore(kDomain, "id", randomUUIDText), made);
+}
+
+TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
+  _files.failWrites(Kind::noSpace);
+  _log.expectLine(Level::error,
+                  "Preference not stored: /preferences/com.florn.veltra.plist: No space left on device");
+  const std::string made = _preferences.textOrStore(kDomain, "id", randomUUIDText);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "id", randomUUIDText), made);
+  EXPECT_EQ(_preferences.text(kDomain, "id"), made);
+  FilePreferences restarted(_files, "/preferences");
+  _files.failWrites({});
+  EXPECT_NE(restarted.textOrStore(kDomain, "id", randomUUIDText), made);
+}
+
+TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
+  fakes::RecordedLog log;
+  fakes::TemporaryDirectory directory;
+  DiskFileStore files;
+  FilePreferences preferences(files, directory.path());
+  std::vector<std::string> texts(4);
+  std::vector<std::thread> callers;
+  for (std::string& text : texts) {
+    callers.emplace_back([&] { text = preferences.textOrStore(kDomain, "id", randomUUIDText); });
+  }
+  for (auto& caller : callers) caller.join();
+  EXPECT_EQ(std::set<std::string>(texts.begin(), texts.end()).size(), 1u);
+  EXPECT_EQ(FilePreferences(files, directory.path()).text(kDomain, "id"), texts[0]);
+}
+
+}  // namespace
+}  // namespace veltrad::platform
