@@ -35,9 +35,9 @@ struct FrameHeader {
 FrameHeader decodeFrameHeader(const char* bytes /* kFrameHeaderBytes */);
 void encodeFrameHeader(const FrameHeader& header, char* bytes /* kFrameHeaderBytes */);
 
-// The frame, header and body, ready for the socket.
-std::string makeFrame(FrameKind kind, std::uint32_t callID, const Dictionary& body,
-                      std::uint8_t descriptors = 0);
+// The frame, header and body, ready for the socket. A body beyond its bound is written all the same: the
+// length of the result shows it.
+std::string makeFrame(FrameKind kind, std::uint32_t callID, Dictionary body, std::uint8_t descriptors = 0);
 
 struct Frame {
   FrameHeader header;
