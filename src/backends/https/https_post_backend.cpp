@@ -100,6 +100,13 @@ Dictionary HTTPSPostBackend::withStopFields(const Dictionary* payload) const {
 
 void HTTPSPostBackend::prepareEventForMessage(Dictionary& event) const {
   if (const SharedDictionary userInfo = userInfoDict()) event.merge(*userInfo);
+  filterEvent(event);
+}
+
+void HTTPSPostBackend::filterEvent(Dictionary& event) const {
+  const FilterTable::Outcome outcome = _filters.filterEvent(event);
+  if (outcome.removed > 0) _services.counters.count("event field removed: by a filter", outcome.removed);
+  if (outcome.hashed > 0) _services.counters.count("event field hashed: by a filter", outcome.hashed);
 }
 
 std::optional<std::string> HTTPSPostBackend::batchEvent(std::uint16_t method, Dictionary event) {
@@ -165,7 +172,9 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     events = _batch.take();
   }
   if (userInfo) {
-    for (Dictionary& event : events) event.merge(*userInfo);
+    Dictionary filtered = *userInfo;
+    filterEvent(filtered);
+    for (Dictionary& event : events) event.merge(filtered);
   }
   const std::size_t count = events.size();
   std::optional<std::string> pretty;

@@ -8,7 +8,9 @@
 
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
+#include "backends/https/client_decision.h"
 #include "backends/https/event_batch.h"
+#include "backends/https/filter_table.h"
 #include "backends/https/post_request.h"
 
 namespace veltrad {
@@ -35,13 +37,21 @@ class HTTPSPostBackend final : public VeltraBackend {
                    const std::string& productFamily);
 
   std::int32_t updateBackendState();
-  void applyExpedite(const Array& clients, const std::optional<std::string>& clientName,
-                     const std::optional<std::string>& serviceName);
+  void applyExpedite(const Dictionary& entry);
+  std::int32_t reportForEveryone(const Array& clients);
+  std::int32_t reportForClient(const Dictionary& entry, const std::optional<std::string>& clientName,
+                               const std::optional<std::string>& serviceName);
+  void logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+                  const std::optional<std::string>& country) const;
+  void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
+  std::string getPersistentIdentifierForCustomClientIDSuffix(
+      const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const;
   bool updatePostLink(const Dictionary& entry);
   void resetBackendStateWithClient(const Dictionary* entry);
 
   Dictionary withStopFields(const Dictionary* payload) const;
   void prepareEventForMessage(Dictionary& event) const;
+  void filterEvent(Dictionary& event) const;
   std::optional<std::string> batchEvent(std::uint16_t method, Dictionary event);
   std::optional<std::string> postEvent(Dictionary event, bool realtime, std::uint16_t method,
                                        std::uint16_t respCode, std::int32_t flag);
@@ -72,6 +82,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::int32_t _extrasOnInternal = 0;
   std::optional<double> _overrideSampling;
   std::optional<std::string> _uuidCustom;
+  FilterTable _filters;
 
   Mutex _batchMutex BACKEND_LOCK{LockRank::backend};
   EventBatch _batch GUARDED_BY(_batchMutex);

@@ -1,9 +1,12 @@
 // The HTTPS post backend: construction, and whether and how it reports for the current client.
 #include "backends/https/https_post_backend.h"
 #include "backends/https/text_lists.h"
+#include "base/json.h"
 #include "platform/counters.h"
+#include "platform/locale.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
+#include "platform/uuid.h"
 #include "protocol/constants.h"
 #include "protocol/veltra.h"
 
@@ -71,40 +74,122 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
   const Array* clients = profile().array("clients");
   if (!clients) return kBackendDisabled;
   const SharedDictionary userInfo = userInfoDict();
-  applyExpedite(*clients, optionalText(userInfo ? userInfo->string(kVeltraUserInfoClientName) : nullptr),
-                optionalText(userInfo ? userInfo->string(kVeltraUserInfoServiceName) : nullptr));
-
-  if (!requireUserInfo()) {
-    const Dictionary* taken = nullptr;
-    for (const Value& client : *clients) {
-      const Dictionary* entry = client.asDictionary();
-      if (entry && updatePostLink(*entry)) {
-        taken = entry;
-        break;
-      }
-    }
-    resetBackendStateWithClient(taken);
-    return kBackendReporting;
+  const auto clientName = optionalText(userInfo ? userInfo->string(kVeltraUserInfoClientName) : nullptr);
+  const auto serviceName = optionalText(userInfo ? userInfo->string(kVeltraUserInfoServiceName) : nullptr);
+  const Dictionary* entry = nullptr;
+  for (const Value& client : *clients) {
+    const Dictionary* candidate = client.asDictionary();
+    if (!candidate || !matchClientNameAndServiceID(*candidate, clientName, serviceName)) continue;
+    entry = candidate;
+    break;
   }
+  if (entry) applyExpedite(*entry);
+  if (!requireUserInfo()) return reportForEveryone(*clients);
   if (!userInfo) return kBackendWaiting;
-  // Consent, lists, filters and sampling are not decided on yet, so nothing may be reported.
-  logInfo("HTTPSPostBackend(updateBackendState): %s: clients that require user info are not served yet",
-          name().c_str());
-  _services.counters.count("back end disabled: clients that require user info are not served yet");
-  return kBackendDisabled;
+  if (!entry) {
+    _services.counters.count("back end disabled: no client entry fits");
+    return kBackendDisabled;
+  }
+  return reportForClient(*entry, clientName, serviceName);
 }
 
-void HTTPSPostBackend::applyExpedite(const Array& clients, const std::optional<std::string>& clientName,
-                                     const std::optional<std::string>& serviceName) {
+std::int32_t HTTPSPostBackend::reportForEveryone(const Array& clients) {
+  const Dictionary* taken = nullptr;
   for (const Value& client : clients) {
     const Dictionary* entry = client.asDictionary();
-    if (!entry || !matchClientNameAndServiceID(*entry, clientName, serviceName)) continue;
-    if (const auto expedite = entry->real("expedite")) {
-      setBatchEvents(*expedite == 0);
-      logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", batchEvents());
-    }
-    return;
+    if (!entry || !updatePostLink(*entry)) continue;
+    taken = entry;
+    break;
   }
+  resetBackendStateWithClient(taken);
+  return kBackendReporting;
+}
+
+std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
+                                               const std::optional<std::string>& clientName,
+                                               const std::optional<std::string>& serviceName) {
+  const auto country = _services.locale.countryCode();
+  const ClientVerdict verdict =
+      decideOnClient(entry, {_dnuEnabled, country, productFamily(), hardwareType(), samplingFactor()});
+  setHierarchy(verdict.hierarchy);
+  _dnuType = verdict.dnuType;
+  if (verdict.filters) _filters.createFiltersFromArray(*verdict.filters);
+  if (verdict.samplingReached) takeSampling(verdict, country);
+  if (verdict.refusal != ClientRefusal::none) {
+    logRefusal(entry, verdict, country);
+    _services.counters.count(reasonOf(verdict.refusal));
+  }
+  if (!verdict.samplingReached) return kBackendDisabled;
+
+  resetBackendStateWithClient(&entry);
+  if (entry.contains("custom_clientId")) {
+    _uuidCustom = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
+  }
+  logDebug(
+      "HTTPSPostBackend(updateBackendState): %s: client found %s:%s, state=%d, samplingFactor=%f, "
+      "hierarchy=%d",
+      name().c_str(), clientName ? clientName->c_str() : "(null)",
+      serviceName ? serviceName->c_str() : "(null)", verdict.state, samplingFactor(), verdict.hierarchy);
+  updatePostLink(entry);
+  return verdict.state;
+}
+
+void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+                                  const std::optional<std::string>& country) const {
+  const auto printed = [&entry](const char* key) {
+    const Value* list = entry.find(key);
+    return list ? writeJSON(*list) : std::string("(null)");
+  };
+  switch (verdict.refusal) {
+    case ClientRefusal::consentMissing:
+      logDebug("HTTPSPostBackend(updateBackendState): reporting disabled by DNU: %d.", verdict.overrideDNU);
+      break;
+    case ClientRefusal::countryNotListed:
+      logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in country code list %s",
+               country ? country->c_str() : "(null)", printed("locale_whitelist").c_str());
+      break;
+    case ClientRefusal::deviceNotListed:
+      logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
+               productFamily().c_str(), printed("device_whitelist").c_str());
+      break;
+    case ClientRefusal::deviceListed:
+      logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
+               hardwareType() ? hardwareType()->c_str() : "(null)", printed("device_blacklist").c_str());
+      break;
+    case ClientRefusal::filtersMissing:
+      logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
+      break;
+    case ClientRefusal::none:
+    case ClientRefusal::thresholdMissing:
+    case ClientRefusal::sampledOut:
+      break;  // the line of the state says it
+  }
+}
+
+void HTTPSPostBackend::takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country) {
+  if (verdict.countryThreshold) {
+    logDebug("HTTPSPostBackend(updateBackendState): sampling threshold for %s changed from %.02f to %.02f",
+             country ? country->c_str() : "(null)", verdict.thresholdBefore.value_or(0),
+             verdict.threshold.value_or(0));
+  }
+  setSamplingThreshold(verdict.threshold);
+  if (verdict.overrideReached) _overrideSampling = verdict.overrideSampling;
+}
+
+std::string HTTPSPostBackend::getPersistentIdentifierForCustomClientIDSuffix(
+    const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const {
+  const std::string key = "uuid:" + clientName.value_or("") + ":" + serviceName.value_or("");
+  std::string value =
+      _services.preferences.textOrStore(platform::kVeltraPreferenceDomain, key, platform::randomUUIDText);
+  logInfo("getPersistentIdentifierForCustomClientIDSuffix: The value for %s: %s", key.c_str(), value.c_str());
+  return value;
+}
+
+void HTTPSPostBackend::applyExpedite(const Dictionary& entry) {
+  const auto expedite = entry.real("expedite");
+  if (!expedite) return;
+  setBatchEvents(*expedite == 0);
+  logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", batchEvents());
 }
 
 bool HTTPSPostBackend::updatePostLink(const Dictionary& entry) {

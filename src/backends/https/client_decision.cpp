@@ -1,0 +1,110 @@
+// The decision on a client entry, step by step.
+#include "backends/https/client_decision.h"
+
+#include "backends/backend.h"
+#include "backends/https/text_lists.h"
+
+namespace veltrad {
+
+namespace {
+// The first element whose "country" array holds the country, letter case respected; or null.
+const Dictionary* countryEntry(const Dictionary& entry, const std::optional<std::string>& country) {
+  const Array* elements = entry.array("per_country_sampling_thresholds");
+  if (!elements || !country) return nullptr;
+  for (const Value& element : *elements) {
+    const Dictionary* candidate = element.asDictionary();
+    const Array* countries = candidate ? candidate->array("country") : nullptr;
+    if (!countries) continue;
+    for (const Value& listed : *countries) {
+      const std::string* code = listed.asString();
+      if (code && *code == *country) return candidate;
+    }
+  }
+  return nullptr;
+}
+
+ClientRefusal refusalOfLists(const Dictionary& entry, const ClientFacts& facts) {
+  if (!matchStringWithList(textsOf(entry.array("locale_whitelist")), facts.country, false)) {
+    return ClientRefusal::countryNotListed;
+  }
+  if (!matchStringWithList(textsOf(entry.array("device_whitelist")), facts.productFamily, true)) {
+    return ClientRefusal::deviceNotListed;
+  }
+  if (matchStringWithList(textsOf(entry.array("device_blacklist")), facts.hardwareType, false)) {
+    return ClientRefusal::deviceListed;
+  }
+  return ClientRefusal::none;
+}
+
+void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientVerdict& verdict) {
+  verdict.samplingReached = true;
+  verdict.threshold = entry.real("sampling_threshold");
+  if (const Dictionary* own = countryEntry(entry, facts.country)) {
+    verdict.countryThreshold = true;
+    verdict.thresholdBefore = verdict.threshold;
+    verdict.threshold = own->real("threshold");
+  }
+  if (!verdict.threshold) {
+    verdict.refusal = ClientRefusal::thresholdMissing;
+    return;
+  }
+  // A factor equal to the threshold is sampled in.
+  if (facts.samplingFactor <= *verdict.threshold) {
+    verdict.state = kBackendReporting;
+    return;
+  }
+  verdict.overrideReached = true;
+  verdict.overrideSampling = entry.real("override_sampling");
+  if (!verdict.overrideSampling || facts.samplingFactor <= *verdict.overrideSampling) {
+    verdict.state = kBackendHeld;
+  } else {
+    verdict.refusal = ClientRefusal::sampledOut;
+  }
+}
+}  // namespace
+
+ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts) {
+  ClientVerdict verdict;
+  verdict.state = kBackendDisabled;
+  verdict.hierarchy = entry.int32("hierarchy").value_or(0);
+  verdict.overrideDNU = entry.int32("override_dnu").value_or(0);
+  if (verdict.overrideDNU == 1) {
+    verdict.dnuType = facts.consent ? 2 : 1;
+  } else if (!facts.consent) {
+    verdict.refusal = ClientRefusal::consentMissing;
+    return verdict;
+  }
+  verdict.refusal = refusalOfLists(entry, facts);
+  if (verdict.refusal != ClientRefusal::none) return verdict;
+  verdict.filters = entry.array("filters");
+  if (!verdict.filters) {
+    verdict.refusal = ClientRefusal::filtersMissing;
+    return verdict;
+  }
+  decideOnSampling(entry, facts, verdict);
+  return verdict;
+}
+
+const char* reasonOf(ClientRefusal refusal) {
+  switch (refusal) {
+    case ClientRefusal::none:
+      return "";
+    case ClientRefusal::consentMissing:
+      return "back end disabled: no consent to diagnostic submission";
+    case ClientRefusal::countryNotListed:
+      return "back end disabled: the country is not in locale_whitelist";
+    case ClientRefusal::deviceNotListed:
+      return "back end disabled: the device is not in device_whitelist";
+    case ClientRefusal::deviceListed:
+      return "back end disabled: the device is in device_blacklist";
+    case ClientRefusal::filtersMissing:
+      return "back end disabled: the client entry has no filters";
+    case ClientRefusal::thresholdMissing:
+      return "back end disabled: the client entry has no sampling threshold";
+    case ClientRefusal::sampledOut:
+      return "back end disabled: sampled out";
+  }
+  return "";
+}
+
+}  // namespace veltrad
