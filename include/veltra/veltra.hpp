@@ -1,0 +1,380 @@
+// libveltra in C++20, header-only: what veltra.h offers, with owners for its handles. Nothing throws; the
+// rules on threads, callbacks and processes are those of veltra.h.
+//
+//   veltra::Session session{{.clientType = 7, .sessionID = 42, .clientName = "phone", .serviceName =
+//   "ringer"}}; if (!session) std::cerr << session.error().description << '\n'; session.start();
+//   session.send(5, 1, {{"codec", "opus"}, {"seconds", 12.5}}).get();
+#ifndef VELTRA_VELTRA_HPP
+#define VELTRA_VELTRA_HPP
+
+#include <concepts>
+#include <cstdint>
+#include <functional>
+#include <future>
+#include <initializer_list>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "veltra/veltra.h"
+
+namespace veltra {
+
+// ---- Values ----
+
+struct Date {
+  double secondsSince1970 = 0;
+};
+struct Data {
+  std::string_view bytes;  // borrowed while the value is made
+};
+
+// A reference to a value, or none. Copies share it.
+class Value {
+ public:
+  Value() = default;
+  template <std::same_as<bool> T>
+  Value(T value) : _value(veltra_boolean(value)) {}
+  template <std::signed_integral T>
+  Value(T value) : _value(veltra_signed(value)) {}
+  template <std::unsigned_integral T>
+  requires(!std::same_as<T, bool>) Value(T value) : _value(veltra_unsigned(value)) {}
+  template <std::floating_point T>
+  Value(T value) : _value(veltra_real(static_cast<double>(value))) {}
+  Value(const char* text) : _value(veltra_string(text)) {}
+  Value(std::string_view text) : _value(veltra_string_with_length(text.data(), text.size())) {}
+  Value(const std::string& text) : Value(std::string_view(text)) {}
+  Value(Date date) : _value(veltra_date(date.secondsSince1970)) {}
+  Value(Data data) : _value(veltra_data(data.bytes.data(), data.bytes.size())) {}
+
+  Value(const Value& other) : _value(veltra_retain(other._value)) {}
+  Value(Value&& other) noexcept : _value(std::exchange(other._value, nullptr)) {}
+  Value& operator=(Value other) noexcept {
+    std::swap(_value, other._value);
+    return *this;
+  }
+  ~Value() { veltra_release(_value); }
+
+  // Takes over one reference.
+  static Value adopt(veltra_value* value) {
+    Value made;
+    made._value = value;
+    return made;
+  }
+  // Adds a reference of its own.
+  static Value share(const veltra_value* value) { return adopt(veltra_retain(value)); }
+
+  explicit operator bool() const { return _value != nullptr; }
+  veltra_type type() const { return veltra_type_of(_value); }
+  const veltra_value* get() const { return _value; }
+  // The caller's from now on.
+  veltra_value* release() { return std::exchange(_value, nullptr); }
+
+  bool boolean() const { return veltra_get_boolean(_value); }
+  std::int64_t asSigned() const { return veltra_get_signed(_value); }
+  std::uint64_t asUnsigned() const { return veltra_get_unsigned(_value); }
+  double real() const { return veltra_get_real(_value); }
+  std::optional<std::string_view> string() const {
+    std::size_t length = 0;
+    const char* text = veltra_get_string(_value, &length);
+    return text ? std::optional(std::string_view(text, length)) : std::nullopt;
+  }
+  std::optional<std::string_view> data() const {
+    std::size_t length = 0;
+    const auto* bytes = static_cast<const char*>(veltra_get_data(_value, &length));
+    return bytes ? std::optional(std::string_view(bytes, length)) : std::nullopt;
+  }
+  std::size_t count() const { return veltra_count(_value); }
+  Value item(std::size_t index) const { return share(veltra_array_item(_value, index)); }
+  Value item(const char* key) const { return share(veltra_dictionary_item(_value, key)); }
+  // By number, in ascending order of the keys' bytes.
+  std::pair<std::string, Value> entry(std::size_t index) const {
+    const char* key = nullptr;
+    Value value = share(veltra_dictionary_entry(_value, index, &key));
+    return {key ? key : "", std::move(value)};
+  }
+
+ private:
+  veltra_value* _value = nullptr;
+};
+
+// {1, "two", 3.0}
+class Array : public Value {
+ public:
+  Array(std::initializer_list<Value> items = {}) : Value(adopt(veltra_array())) {
+    for (const Value& item : items) append(item);
+  }
+  bool append(Value item) {
+    return veltra_array_append(const_cast<veltra_value*>(get()), item.release()) == VELTRA_OK;
+  }
+};
+
+// {{"codec", "opus"}, {"seconds", 12.5}}
+class Dictionary : public Value {
+ public:
+  using Entry = std::pair<const char*, Value>;
+  Dictionary(std::initializer_list<Entry> entries = {}) : Value(adopt(veltra_dictionary())) {
+    for (const Entry& entry : entries) set(entry.first, entry.second);
+  }
+  bool set(const char* key, Value value) {
+    return veltra_dictionary_set(const_cast<veltra_value*>(get()), key, value.release()) == VELTRA_OK;
+  }
+};
+
+// ---- Answers ----
+
+using Status = veltra_status;
+using Statistics = veltra_statistics;
+
+struct Error {
+  Status status = VELTRA_OK;
+  std::string domain;
+  std::int64_t code = 0;
+  std::string description;
+};
+
+// A value, or why there is none.
+template <typename T>
+class Result {
+ public:
+  Result(T value) : _side(std::in_place_index<0>, std::move(value)) {}
+  Result(Error error) : _side(std::in_place_index<1>, std::move(error)) {}
+  explicit operator bool() const { return _side.index() == 0; }
+  // Only where there is one.
+  const T& operator*() const { return *std::get_if<0>(&_side); }
+  const T* operator->() const { return std::get_if<0>(&_side); }
+  // Empty where there is a value.
+  Error error() const { return *this ? Error{} : *std::get_if<1>(&_side); }
+
+ private:
+  std::variant<T, Error> _side;
+};
+
+// The backends that report; absent when none could be had.
+using Backends = std::optional<std::vector<std::string>>;
+
+// What a call was answered.
+struct Reply {
+  Status status = VELTRA_OK;
+  std::optional<std::string> text;
+  Backends backends;
+  bool uploaded = false;
+  std::optional<Error> error;  // of the answer, or of the call where the status is not VELTRA_OK
+
+  explicit operator bool() const { return status == VELTRA_OK; }
+
+  static Reply of(const veltra_reply* reply) {
+    Reply made;
+    made.status = veltra_reply_status(reply);
+    std::size_t length = 0;
+    if (const char* text = veltra_reply_text(reply, &length)) made.text.emplace(text, length);
+    if (const veltra_value* names = veltra_reply_backends(reply)) {
+      made.backends.emplace();
+      for (std::size_t i = 0; i < veltra_count(names); ++i) {
+        const char* name = veltra_get_string(veltra_array_item(names, i), &length);
+        if (name) made.backends->emplace_back(name, length);
+      }
+    }
+    made.uploaded = veltra_reply_uploaded(reply);
+    if (const char* description = veltra_reply_error_description(reply)) {
+      made.error =
+          Error{made.status, veltra_reply_error_domain(reply), veltra_reply_error_code(reply), description};
+    }
+    return made;
+  }
+  static Reply of(Status status) {
+    Reply made;
+    made.status = status;
+    made.error = Error{status, "", -1, veltra_status_text(status)};
+    return made;
+  }
+};
+
+using Callback = std::function<void(const Reply&)>;
+
+// ---- Sessions ----
+
+// A copy of a message of this session or of one below it. Everything empty or zero: the end of aggregation.
+struct Aggregated {
+  Value sessionInfo;
+  double timestamp = 0;  // seconds since 1970
+  std::uint16_t category = 0;
+  std::uint16_t type = 0;
+  Value payload;
+};
+
+// What is absent is not said to the daemon.
+struct Options {
+  std::optional<std::int32_t> clientType = {};  // 0 to 17
+  std::optional<std::uint32_t> sessionID = {};
+  std::optional<std::uint16_t> clientVersion = {};
+  std::optional<std::string> clientName = {};
+  std::optional<std::string> serviceName = {};
+  Value userInfo = {};  // a dictionary; the two names are added to it
+  bool requireUserInfo = false;
+  bool batchEvents = false;
+  std::function<void(const Aggregated&)> aggregated = {};  // given: this session aggregates
+  std::optional<std::string> root = {};                    // absent: VELTRA_ROOT, else "/"
+  std::size_t queueBytes = 0;                              // 1 MiB where 0
+};
+
+// A session from its making to its end. One that could not be made is false, says why, and refuses every
+// call.
+class Session {
+ public:
+  explicit Session(const Options& options = {}) : _aggregated(sharedHandler(options.aggregated)) {
+    veltra_session_options plain;
+    veltra_session_options_init(&plain);
+    plain.root = text(options.root);
+    plain.has_client_type = options.clientType.has_value();
+    plain.client_type = options.clientType.value_or(0);
+    plain.has_session_id = options.sessionID.has_value();
+    plain.session_id = options.sessionID.value_or(0);
+    plain.has_client_version = options.clientVersion.has_value();
+    plain.client_version = options.clientVersion.value_or(0);
+    plain.require_user_info = options.requireUserInfo;
+    plain.batch_events = options.batchEvents;
+    plain.user_info = options.userInfo.get();
+    plain.client_name = text(options.clientName);
+    plain.service_name = text(options.serviceName);
+    plain.aggregated = _aggregated ? &onAggregated : nullptr;
+    plain.aggregated_context = _aggregated.get();
+    plain.queue_bytes = options.queueBytes;
+    char* why = nullptr;
+    _session = veltra_session_create(&plain, &_error.status, &why);
+    if (why) _error.description = why;
+    veltra_free(why);
+  }
+  Session(Session&& other) noexcept
+      : _aggregated(std::move(other._aggregated)),
+        _session(std::exchange(other._session, nullptr)),
+        _error(std::move(other._error)) {}
+  Session& operator=(Session&& other) noexcept {
+    if (this != &other) {
+      close();
+      _aggregated = std::move(other._aggregated);
+      _session = std::exchange(other._session, nullptr);
+      _error = std::move(other._error);
+    }
+    return *this;
+  }
+  ~Session() { close(); }
+
+  explicit operator bool() const { return _session != nullptr; }
+  const Error& error() const { return _error; }
+
+  // These wait for the daemon.
+  Result<Backends> start() { return backends(wait(&veltra_session_start_wait)); }
+  Result<Backends> states(const Value& userInfo = {}) {
+    return backends(wait(&veltra_session_states_wait, userInfo.get()));
+  }
+  Result<std::optional<std::string>> displayURL() {
+    Reply reply = wait(&veltra_session_display_url_wait);
+    if (!reply) return *std::move(reply.error);
+    return std::move(reply.text);
+  }
+  Reply flush() { return wait(&veltra_session_flush_wait); }
+  Reply finish() { return wait(&veltra_session_finish_wait); }
+  Reply sendAndWait(std::uint16_t category, std::uint16_t type, const Dictionary& payload,
+                    std::uint32_t flag = 0) {
+    return wait(&veltra_session_send_wait, category, type, payload.get(), flag);
+  }
+
+  // These do not wait. flag: 1 and 3 realtime, 2 and 3 override sampling.
+  std::future<Reply> send(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
+                          std::uint32_t flag = 0) {
+    return promised(
+        [&](Callback callback) { return send(category, type, payload, std::move(callback), flag); });
+  }
+  Status send(std::uint16_t category, std::uint16_t type, const Dictionary& payload, Callback callback,
+              std::uint32_t flag = 0) {
+    return call(std::move(callback), &veltra_session_send, category, type, payload.get(), flag);
+  }
+  // Asks for no answer: the cheapest.
+  Status post(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
+              std::uint32_t flag = 0) {
+    return veltra_session_send(_session, category, type, payload.get(), flag, nullptr, nullptr);
+  }
+  // "category", "type", "payload", "flag" as they stand; the daemon checks them.
+  std::future<Reply> send(const Dictionary& message) {
+    return promised([&](Callback callback) {
+      return call(std::move(callback), &veltra_session_send_dictionary, message.get());
+    });
+  }
+  Status start(Callback callback) { return call(std::move(callback), &veltra_session_start); }
+  Status flush(Callback callback) { return call(std::move(callback), &veltra_session_flush); }
+  Status states(const Value& userInfo, Callback callback) {
+    return call(std::move(callback), &veltra_session_states, userInfo.get());
+  }
+  Status displayURL(Callback callback) { return call(std::move(callback), &veltra_session_display_url); }
+  Status finish(Callback callback) { return call(std::move(callback), &veltra_session_finish); }
+
+  Statistics statistics() const {
+    Statistics counts{};
+    veltra_session_statistics(_session, &counts);
+    return counts;
+  }
+  // Returns how many calls were lost unwritten. The destructor does the same. Not inside a callback.
+  std::uint64_t close() { return veltra_session_close(std::exchange(_session, nullptr)); }
+
+ private:
+  using Handler = std::function<void(const Aggregated&)>;
+
+  static const char* text(const std::optional<std::string>& given) {
+    return given ? given->c_str() : nullptr;
+  }
+  static std::unique_ptr<Handler> sharedHandler(const Handler& handler) {
+    return handler ? std::make_unique<Handler>(handler) : nullptr;
+  }
+  static void onAggregated(void* context, const veltra_value* sessionInfo, double timestamp,
+                           std::uint16_t category, std::uint16_t type, const veltra_value* payload) {
+    (*static_cast<Handler*>(context))(
+        Aggregated{Value::share(sessionInfo), timestamp, category, type, Value::share(payload)});
+  }
+  static void onReply(void* context, const veltra_reply* reply) {
+    const std::unique_ptr<Callback> callback(static_cast<Callback*>(context));
+    (*callback)(Reply::of(reply));
+  }
+
+  template <typename Function, typename... Arguments>
+  Reply wait(Function function, Arguments... arguments) {
+    veltra_reply* answered = nullptr;
+    function(_session, arguments..., &answered);
+    Reply reply = Reply::of(answered);
+    veltra_reply_release(answered);
+    return reply;
+  }
+  // An empty callback asks for no answer.
+  template <typename Function, typename... Arguments>
+  Status call(Callback callback, Function function, Arguments... arguments) {
+    if (!callback) return function(_session, arguments..., nullptr, nullptr);
+    auto kept = std::make_unique<Callback>(std::move(callback));
+    const Status status = function(_session, arguments..., &onReply, kept.get());
+    if (status == VELTRA_OK) (void)kept.release();  // onReply's
+    return status;
+  }
+  template <typename Call>
+  static std::future<Reply> promised(Call start) {
+    auto promise = std::make_shared<std::promise<Reply>>();
+    std::future<Reply> future = promise->get_future();
+    const Status status = start([promise](const Reply& reply) { promise->set_value(reply); });
+    if (status != VELTRA_OK) promise->set_value(Reply::of(status));
+    return future;
+  }
+  static Result<Backends> backends(Reply reply) {
+    if (!reply) return *std::move(reply.error);
+    return std::move(reply.backends);
+  }
+
+  std::unique_ptr<Handler> _aggregated;
+  veltra_session* _session = nullptr;
+  Error _error;
+};
+
+}  // namespace veltra
+
+#endif
