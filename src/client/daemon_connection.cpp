@@ -32,7 +32,7 @@ void setCallID(std::string& frame, std::uint32_t callID) {
 
 }  // namespace
 
-std::unique_ptr<DaemonConnection> DaemonConnection::make(DaemonSocket daemon, std::size_t queueBytes,
+std::shared_ptr<DaemonConnection> DaemonConnection::make(DaemonSocket daemon, std::size_t queueBytes,
                                                          EventHandler handler, std::string& error) {
   std::unique_ptr<DaemonConnection> made(
       new DaemonConnection(std::move(daemon), queueBytes, std::move(handler)));
@@ -84,7 +84,6 @@ Answer DaemonConnection::sendAndWait(std::string frame) {
   Lock lock(_lock);
   const veltra_status status = enqueue(std::move(frame), Call{&waiter, nullptr, nullptr});
   if (status != VELTRA_OK) return answerOfStatus(status);
-  ++_inside;
   while (!waiter.answer) {
     if (_reader == Reader::nobody) {
       readAsWaiter(waiter);
@@ -95,7 +94,6 @@ Answer DaemonConnection::sendAndWait(std::string frame) {
     }
   }
   if (_reader == Reader::nobody) passOnReading();
-  if (--_inside == 0 && _closing) _left.notifyAll();
   return std::move(waiter.answer);
 }
 
@@ -294,7 +292,6 @@ std::uint64_t DaemonConnection::close() {
     }
     end();
     ::shutdown(_socket.get(), SHUT_RDWR);  // a thread that reads comes back
-    while (_inside > 0) _left.wait(_lock);
     _stopping = true;
     wake();
   }

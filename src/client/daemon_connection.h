@@ -34,7 +34,8 @@ inline constexpr std::size_t kMostWaitingEvents = 4096;
 // connection's thread does. Both hand each answer to the thread that waits for it, or into the queue of
 // callbacks, which the connection's thread alone runs, under no lock.
 //
-// close() ends it; no other call may start after that.
+// close() ends it; no other call may start after that. Threads that wait hold a share of it, since they leave
+// after their answer is there.
 class DaemonConnection {
  public:
   // Gets an event's body on the connection's thread.
@@ -42,7 +43,7 @@ class DaemonConnection {
 
   // Null when the system gives no descriptors or no thread; `error` says which. Without a handler events are
   // dropped unread.
-  static std::unique_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
+  static std::shared_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
                                                 EventHandler handler, std::string& error);
   ~DaemonConnection();
   DaemonConnection(const DaemonConnection&) = delete;
@@ -128,8 +129,6 @@ class DaemonConnection {
   Mutex _lock{LockRank::leaf};
   Reader _reader GUARDED_BY(_lock) = Reader::ownThread;  // which first takes what came behind the hello
   std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
-  std::size_t _inside GUARDED_BY(_lock) = 0;             // threads in sendAndWait
-  Condition _left GUARDED_BY(_lock);                     // _inside became 0
   OutFrames _out GUARDED_BY(_lock);
   std::unordered_map<std::uint32_t, Call> _calls GUARDED_BY(_lock);
   std::size_t _callbacks GUARDED_BY(_lock) = 0;  // of _calls

@@ -12,7 +12,7 @@ using veltrad::CallFrame;
 using veltrad::Dictionary;
 
 struct veltra_session {
-  std::unique_ptr<veltrad::DaemonConnection> connection;
+  std::shared_ptr<veltrad::DaemonConnection> connection;
 };
 
 namespace {
@@ -52,8 +52,13 @@ veltra_status send(veltra_session* session, CallFrame call, veltra_callback call
 
 veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply** reply) {
   const veltra_status status = session ? call.status : VELTRA_INVALID;
-  Answer answer = status == VELTRA_OK ? session->connection->sendAndWait(std::move(call.frame))
-                                      : veltrad::answerOfStatus(status);
+  Answer answer;
+  if (status == VELTRA_OK) {
+    const auto connection = session->connection;  // outlasts a close() that ends this call
+    answer = connection->sendAndWait(std::move(call.frame));
+  } else {
+    answer = veltrad::answerOfStatus(status);
+  }
   const veltra_status result = answer->status;
   if (reply) *reply = answer.release();
   return result;
