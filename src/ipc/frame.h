@@ -59,6 +59,8 @@ class FrameReader {
   bool inFrame() const;
   // Nothing has come that was not handed out.
   bool empty() const { return _taken == _filled; }
+  // What the buffer holds of memory.
+  std::size_t size() const { return _buffer.size(); }
 
  private:
   std::string _buffer;      // its size is the room there is

@@ -55,6 +55,7 @@ Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
       _mostConnections(options.mostConnections),
       _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
       _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
+      _budget(options.readBudget),
       _socket(std::move(options.socket)),
       _spare(openSpare()) {}
 
@@ -178,7 +179,7 @@ void Listener::admit(FileDescriptor socket) {
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
   auto connection = std::make_shared<ipc::SocketConnection>(
-      number, std::move(socket), std::move(peer.value()), _entitlements, _counters);
+      number, std::move(socket), std::move(peer.value()), _entitlements, _counters, _budget);
   if (connection->usable() && startClient(number, uid, connection)) return;
   _counters.count("connection refused: no thread or descriptor is left");
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");

@@ -33,12 +33,14 @@ std::string refusalFrame(const std::string& description) {
 }
 
 SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                                   platform::Entitlements& entitlements, platform::Counters& counters)
+                                   platform::Entitlements& entitlements, platform::Counters& counters,
+                                   ReadBudget& budget)
     : _out(std::make_shared<OutQueue>(std::move(socket), counters)),
       _peer(std::move(peer)),
       _description(describe(number, _peer)),
       _entitlements(entitlements),
-      _counters(counters) {}
+      _counters(counters),
+      _reader(budget) {}
 
 std::optional<Value> SocketConnection::valueForEntitlement(std::string_view name) {
   return _entitlements.valueForEntitlement(name, _peer);
@@ -123,6 +125,8 @@ bool SocketConnection::receive() {
         return true;
       case SocketReader::Got::badDescriptors:
         return violation("More descriptors came than a frame can carry.");
+      case SocketReader::Got::overBudget:
+        return violation("Too many bytes of unfinished frames wait in the daemon; try again later.");
     }
   }
 }

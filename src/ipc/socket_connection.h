@@ -18,12 +18,12 @@ namespace veltrad::ipc {
 
 // Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
 // the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
-// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements and counters outlive it.
-// A session and its connection hold each other until run() returns.
+// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, counters and budget
+// outlive it. A session and its connection hold each other until run() returns.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
   SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                   platform::Entitlements& entitlements, platform::Counters& counters);
+                   platform::Entitlements& entitlements, platform::Counters& counters, ReadBudget& budget);
 
   // False: the system had no wake-up descriptor for it.
   bool usable() const { return _out->usable(); }

@@ -35,6 +35,10 @@ bool takeControl(msghdr& message, std::deque<platform::FileDescriptor>& into) {
 
 SocketReader::Got SocketReader::receive(int socket) {
   const auto [place, size] = _frames.room(std::max(_wanted, kLeastRoom));
+  if (_frames.size() != _held) {
+    if (!_budget.change(_held, _frames.size())) return Got::overBudget;
+    _held = _frames.size();
+  }
   iovec bytes{place, size};
   alignas(cmsghdr) char control[CMSG_SPACE(kDescriptorsAtOnce * sizeof(int))];
   msghdr message{};

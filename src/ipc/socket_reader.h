@@ -5,6 +5,7 @@
 #include <optional>
 
 #include "ipc/frame.h"
+#include "ipc/read_budget.h"
 #include "platform/file_descriptor.h"
 
 namespace veltrad::ipc {
@@ -18,7 +19,13 @@ class SocketReader {
     nothing,         // none for now
     end,             // the client has closed, or its socket failed
     badDescriptors,  // more than a frame can carry, or the system had no room for them
+    overBudget,      // the unfinished frames of all clients hold too much
   };
+
+  explicit SocketReader(ReadBudget& budget) : _budget(budget) {}
+  ~SocketReader() { _budget.change(_held, 0); }
+  SocketReader(const SocketReader&) = delete;
+  SocketReader& operator=(const SocketReader&) = delete;
 
   Got receive(int socket);
   FrameReader::Next next(Frame& frame) { return _frames.next(frame); }
@@ -29,6 +36,8 @@ class SocketReader {
   bool moreLikely() const { return _moreLikely; }
 
  private:
+  ReadBudget& _budget;
+  std::size_t _held = 0;  // what the budget knows of
   FrameReader _frames;
   std::deque<platform::FileDescriptor> _descriptors;
   std::size_t _wanted = 0;

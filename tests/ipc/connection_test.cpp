@@ -1,6 +1,7 @@
 // How connections begin and end: greeting, refusals, broken frames, descriptors, floods, the stop.
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -333,6 +334,40 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
             "Connection refused: 1 connections are open, and no more are taken.");
 }
 
+TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
+  Door door(true, 4096, 1024, 1u << 20);
+  const std::string most =
+      Client::callFrame(1, "uploadLogData:completionHandler:", {{"data", Array{std::string(900'000, 'x')}}},
+                        FrameKind::largeCall);
+  for (int round = 0; round < 3; ++round) {  // what a connection held comes back with its end, or its frame's
+    SCOPED_TRACE(round);
+    Client first = door.client();
+    first.greet();
+    first.send(most.substr(0, 800'000));
+    first.waitUntilRead();
+    Client second = door.client();
+    second.greet();
+    second.send(most.substr(0, 800'000));
+    const auto refusal = second.receive();
+    ASSERT_TRUE(refusal);
+    EXPECT_EQ(refusal->description(),
+              "Too many bytes of unfinished frames wait in the daemon; try again later.");
+    EXPECT_TRUE(second.atEnd());
+    first.send(most.substr(800'000));
+    ASSERT_TRUE(first.receive());
+    first.call(2, kSend, message(1, 1));
+    ASSERT_TRUE(first.receive());
+    ASSERT_TRUE(door.journal.waitForLines(static_cast<std::size_t>(4 * round + 4)));
+    Client third = door.client();
+    third.greet();
+    third.send(most);
+    EXPECT_EQ(third.receive()->callID, 1u);
+    third.close();
+    first.close();
+    ASSERT_TRUE(door.journal.waitForLines(static_cast<std::size_t>(9 * (round + 1))));
+  }
+}
+
 TEST(Listener, ComesThroughAFullTableOfDescriptors) {
   Door door;
   Client before = door.client();
@@ -342,6 +377,10 @@ TEST(Listener, ComesThroughAFullTableOfDescriptors) {
   // A client whose socket is there already when the table fills up.
   platform::FileDescriptor late(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   std::vector<platform::FileDescriptor> fill;
+  rlimit usual{};
+  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
+  const rlimit few{256, usual.rlim_max};
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &few), 0);
   while (true) {
     platform::FileDescriptor one(::open("/dev/null", O_RDONLY | O_CLOEXEC));
     if (!one.isOpen()) break;
@@ -361,6 +400,7 @@ TEST(Listener, ComesThroughAFullTableOfDescriptors) {
   before.call(1, kSend, message(1, 1));
   EXPECT_EQ(before.receive()->callID, 1u);
   fill.clear();
+  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
   door.client().greet();
   door.log.expectLine(platform::LogLevel::warning,
                       "listener: A connection could not be accepted: Too many open files");

@@ -280,17 +280,18 @@ class Client {
 // A door in a directory of its own. The delegate asks for the entitlement as the daemon does.
 class Door : public ListenerDelegate {
  public:
-  explicit Door(bool granted = true, std::size_t most = 4096, std::size_t mostOfOneUser = 1024)
+  explicit Door(bool granted = true, std::size_t most = 4096, std::size_t mostOfOneUser = 1024,
+                std::size_t readBudget = ipc::kReadBudget)
       : root(makeDirectory()), _entitlements(_files, "entitlements.plist") {
     const Dictionary rule{{"uid", static_cast<unsigned>(::getuid())},
                           {"entitlements", Dictionary{{kVeltraEntitlement, granted}}}};
     _files.put("entitlements.plist", writeBinaryPropertyList(Value(Array{Value(rule)})));
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
-    _listener =
-        std::make_unique<Listener>(ipc::ListenerOptions{std::move(socket.value()), _entitlements, counters,
-                                                        root.entitlementsPath(), most, mostOfOneUser},
-                                   *this);
+    _listener = std::make_unique<Listener>(
+        ipc::ListenerOptions{std::move(socket.value()), _entitlements, counters, root.entitlementsPath(),
+                             most, mostOfOneUser, readBudget},
+        *this);
     EXPECT_TRUE(_listener->resume());
   }
   ~Door() override {

@@ -1,0 +1,175 @@
+// What a call costs over a bare socket: the round trip of a message with its reply through a connection of
+// the daemon, against two threads that throw the same bytes to and fro. Prints nanoseconds and the ratio,
+// with both ends on one core and with both free.
+#include <fmt/format.h>
+#include <sched.h>
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstring>
+#include <functional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "ipc/frame.h"
+#include "ipc/socket_connection.h"
+#include "platform/file_store.h"
+
+namespace {
+
+using namespace veltrad;
+using Clock = std::chrono::steady_clock;
+
+constexpr int kRounds = 15;
+constexpr int kCallsARound = 4000;
+
+class EchoingSession final : public ClientSessionInterface {
+ public:
+  void setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {}
+  void startConfigWithCompletionHandler(NamesReply) override {}
+  void fetchStatesWithUserInfo(OptionalDictionary, NamesReply) override {}
+  void fetchDisplayURL(StringReply) override {}
+  void sendMessageWithCategory(std::uint16_t, std::uint16_t, OptionalDictionary, StringReply reply) override {
+    if (reply) reply("queued");
+  }
+  void sendMessageWithDictionary(Dictionary, StringReply) override {}
+  void flushMessagesWithCompletion(FlushReply reply) override {
+    if (reply) reply(std::nullopt, std::nullopt);
+  }
+  void finishSessionWithReply(StringReply) override {}
+  void uploadFileAtPath(std::string, std::string, BooleanReply) override {}
+  void uploadLogData(Array, UploadLogDataReply) override {}
+  void sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t, std::uint16_t,
+                                  OptionalDictionary, StringReply) override {}
+  void end() override {}
+  std::string description() const override { return "echoing session"; }
+};
+
+std::string callFrame(std::uint32_t id) {
+  Dictionary payload;
+  for (int i = 0; i < 8; ++i) payload.set(fmt::format("field{}", i), fmt::format("value number {}", i));
+  payload.set("seconds", 12.5);
+  payload.set("count", 42);
+  Dictionary body{{"op", "sendMessageWithCategory:type:payload:reply:"}};
+  body.set("args", Dictionary{{"category", 5}, {"type", 1}, {"payload", std::move(payload)}});
+  return ipc::makeFrame(ipc::FrameKind::call, id, std::move(body));
+}
+
+void pinTo(int core) {
+  cpu_set_t cores;
+  CPU_ZERO(&cores);
+  if (core >= 0) {
+    CPU_SET(core, &cores);
+  } else {
+    for (unsigned i = 0; i < std::thread::hardware_concurrency(); ++i) CPU_SET(i, &cores);
+  }
+  ::sched_setaffinity(0, sizeof cores, &cores);  // threads made later inherit it
+}
+
+bool sendAll(int socket, const std::string& bytes) {
+  return ::send(socket, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+}
+
+bool receiveAll(int socket, std::size_t size) {
+  char bytes[4096];
+  while (size > 0) {
+    const ssize_t count = ::recv(socket, bytes, std::min(size, sizeof bytes), 0);
+    if (count <= 0) return false;
+    size -= static_cast<std::size_t>(count);
+  }
+  return true;
+}
+
+// Nanoseconds a round trip, the client's side of it.
+double roundTrip(int socket, const std::string& request, std::size_t replySize, int calls = kCallsARound) {
+  const auto start = Clock::now();
+  for (int i = 0; i < calls; ++i) {
+    if (!sendAll(socket, request) || !receiveAll(socket, replySize)) {
+      std::fputs("the other end is gone\n", stderr);
+      std::exit(1);
+    }
+  }
+  return std::chrono::duration<double, std::nano>(Clock::now() - start).count() / calls;
+}
+
+struct Ends {
+  Ends() {
+    int ends[2];
+    if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) std::exit(1);
+    client = platform::FileDescriptor(ends[0]);
+    server = platform::FileDescriptor(ends[1]);
+  }
+  platform::FileDescriptor client;
+  platform::FileDescriptor server;
+};
+
+double median(std::vector<double> values) {
+  std::sort(values.begin(), values.end());
+  return values[values.size() / 2];
+}
+
+// Alternating rounds, so that both see the same machine.
+void compare(const char* name, int core) {
+  pinTo(core);
+  const std::string request = callFrame(1);
+  const std::string reply =
+      ipc::makeFrame(ipc::FrameKind::reply, 1, {{"results", Dictionary{{"reply", "queued"}}}});
+
+  Ends bare;
+  std::thread echo([&] {
+    while (receiveAll(bare.server.get(), request.size()) && sendAll(bare.server.get(), reply)) {
+    }
+  });
+
+  platform::DiskFileStore files;
+  platform::Entitlements entitlements(files, "/nonexistent");
+  platform::Counters counters;
+  ipc::ReadBudget budget;
+  Ends served;
+  const auto connection = std::make_shared<ipc::SocketConnection>(
+      1, std::move(served.server), platform::Peer{}, entitlements, counters, budget);
+  connection->setExportedObject(std::make_shared<EchoingSession>());
+  connection->resume();
+  std::thread serving([&] { connection->run(); });
+  const std::string hello = ipc::makeFrame(ipc::FrameKind::hello, 0, {{"wire", 1}, {"library", "8.0"}});
+  const std::size_t answer =
+      ipc::makeFrame(ipc::FrameKind::hello, 0, {{"wire", 1}, {"daemon", "8.0"}}).size();
+  sendAll(served.client.get(), hello);
+  receiveAll(served.client.get(), answer);
+
+  std::vector<double> floors;
+  std::vector<double> calls;
+  for (int i = 0; i < kRounds; ++i) {
+    floors.push_back(roundTrip(bare.client.get(), request, reply.size()));
+    calls.push_back(roundTrip(served.client.get(), request, reply.size()));
+  }
+  std::printf("%s: bare socket %.0f ns, call with reply %.0f ns, ratio %.2f (%zu bytes there, %zu back)\n",
+              name, median(floors), median(calls), median(calls) / median(floors), request.size(),
+              reply.size());
+
+  // One way: no reply is wanted, the last call's reply ends it.
+  std::string burst;
+  for (int i = 0; i < 100; ++i) burst += callFrame(0);
+  const auto start = Clock::now();
+  for (int i = 0; i < 500; ++i) sendAll(served.client.get(), burst);
+  roundTrip(served.client.get(), request, reply.size(), 1);
+  const double seconds = std::chrono::duration<double>(Clock::now() - start).count();
+  std::printf("%s: %.0f messages a second without replies\n", name, 50'000 / seconds);
+
+  bare.client.reset();
+  served.client.reset();
+  ::shutdown(bare.server.get(), SHUT_RDWR);
+  echo.join();
+  serving.join();
+}
+
+}  // namespace
+
+int main() {
+  compare("one core", 0);
+  compare("both free", -1);
+  return 0;
+}
