@@ -13,7 +13,7 @@ bool printLine(std::string_view line) {
   std::fwrite(line.data(), 1, line.size(), stdout);
   std::fputc('\n', stdout);
   if (std::fflush(stdout) == 0 && !std::ferror(stdout)) return true;
-  complain(fmt::format("cannot write to standard output: {}", std::strerror(errno)));
+  complain(fmt::format("Cannot write to standard output: {}.", std::strerror(errno)));
   return false;
 }
 

@@ -25,7 +25,7 @@ std::optional<Answer> call(ClientSession& session, const Options& options) {
 
 // Says why there is no answer.
 int failed(const std::optional<Answer>& answer) {
-  complain(answer ? answer->error->description : "interrupted");
+  complain(answer ? answer->error->description : "Interrupted.");
   return 1;
 }
 
@@ -40,7 +40,7 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
   const auto started = session.start();
   if (!started || started->status != VELTRA_OK) return failed(started);
   if (!started->backends)
-    complain("note: the daemon has no configuration for this client, so nothing reports");
+    complain("Nothing reports for this client: the daemon has no configuration for its client type.");
   const auto answer = call(session, options);
   if (!answer) return failed(answer);
   if (!printLine(formatAnswer(operationOf(options.command), *answer))) return 1;

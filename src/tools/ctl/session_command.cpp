@@ -39,14 +39,23 @@ class SessionRun {
     const Operation operation = line.value().operation;
     const auto answer = answerTo(line.value());
     if (!answer) return 0;
+    if (answer->status != VELTRA_OK) ++_unanswered;
     const Ended ended = print(formatAnswer(operation, *answer));
     if (ended || answer->status != VELTRA_NO_DAEMON) return ended;
-    complain("the connection to veltrad has ended: is it still running?");
+    complain(
+        "The connection to the daemon has ended: see whether veltrad still runs, and start a new session.");
     return 1;
   }
 
   Ended malformed(std::uint64_t number, std::string_view description) {
     return print(formatMalformedLine(number, description));
+  }
+
+  // The exit status when nothing else speaks against 0.
+  int end() const {
+    if (_unanswered == 0) return 0;
+    complain(fmt::format("{} calls ended without an answer.", _unanswered));
+    return 1;
   }
 
  private:
@@ -77,6 +86,7 @@ class SessionRun {
 
   ClientSession& _session;
   Interrupt& _interrupt;
+  std::uint64_t _unanswered = 0;
 };
 
 int runLines(SessionRun& run, LineReader& lines) {
@@ -92,9 +102,9 @@ int runLines(SessionRun& run, LineReader& lines) {
         break;
       case LineReader::Got::end:
       case LineReader::Got::interrupted:
-        return 0;
+        return run.end();
       case LineReader::Got::failed:
-        complain(fmt::format("cannot read the input: {}", std::strerror(errno)));
+        complain(fmt::format("Cannot read the input: {}.", std::strerror(errno)));
         return 2;
     }
     if (ended) return *ended;
@@ -121,7 +131,7 @@ int runSession(const Options& options, Interrupt& interrupt) {
   const Ended refused = run.start();
   LineReader lines(options.input ? file.get() : STDIN_FILENO, kLongestLine, interrupt);
   const int status = refused ? *refused : runLines(run, lines);
-  if (const std::uint64_t lost = session.close()) complain(fmt::format("{} calls were lost unsent", lost));
+  if (const std::uint64_t lost = session.close()) complain(fmt::format("{} calls were lost unsent.", lost));
   return status;
 }
 

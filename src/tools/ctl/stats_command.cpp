@@ -20,12 +20,14 @@ bool isAlive(std::int64_t pid) {
   return pid > 0 && pid <= INT32_MAX && (kill(static_cast<pid_t>(pid), 0) == 0 || errno == EPERM);
 }
 
-int noFile(const platform::FileFailure& failure) {
+int noFile(const std::string& path, const platform::FileFailure& failure) {
   using Kind = platform::FileFailure::Kind;
   if (failure.kind == Kind::notFound) {
-    complain(fmt::format("{}: start veltrad, or name its directory with --root", failure.description));
+    complain(fmt::format(
+        "No daemon has counted anything in {}: start veltrad, or name its root with VELTRA_ROOT or --root.",
+        path));
   } else if (failure.kind == Kind::noAccess) {
-    complain(fmt::format("{}: run veltractl as the user that runs veltrad", failure.description));
+    complain(fmt::format("{}: run veltractl as the user that runs veltrad.", failure.description));
   } else {
     complain(failure.description);
   }
@@ -38,18 +40,18 @@ int runStats(const Options& options) {
   const auto root = options.root ? platform::Root(*options.root) : platform::Root::fromEnvironment();
   const std::string path = root.countersPath();
   const auto file = platform::DiskFileStore().read(path, kLargestCounters);
-  if (!file) return noFile(file.error());
+  if (!file) return noFile(path, file.error());
   const auto report = readCounters(file.value());
   if (!report) {
     complain(
-        fmt::format("{}: expected the counters of veltrad, found something else; restart veltrad", path));
+        fmt::format("{}: expected the counters of veltrad, found something else; restart veltrad.", path));
     return 1;
   }
   std::string_view text = file.value();
   while (!text.empty() && text.back() == '\n') text.remove_suffix(1);
   if (!printLine(options.json ? std::string(text) : formatCounters(*report))) return 1;
   if (isAlive(report->pid)) return 0;
-  complain("veltrad is not running: these are the counts of its last run; start it for new ones");
+  complain("veltrad is not running, and these are the counts of its last run: start it for new ones.");
   return 1;
 }
 
