@@ -76,22 +76,23 @@ void CurlTransfer::refuse(HTTPError error) {
   std::string().swap(_request.body);
 }
 
-bool CurlTransfer::attach(CURL* easy, TrustStore& trust, Time now) {
-  if (curl_easy_setopt(easy, CURLOPT_URL, _request.url.c_str()) != CURLE_OK || !setHeaders(easy))
+bool CurlTransfer::attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust, Time now) {
+  _curl = &curl;
+  if (_curl->easySetopt(easy, CURLOPT_URL, _request.url.c_str()) != CURLE_OK || !setHeaders(easy))
     return false;
-  curl_easy_setopt(easy, CURLOPT_PROTOCOLS_STR, "https");
-  curl_easy_setopt(easy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
-  curl_easy_setopt(easy, CURLOPT_FOLLOWLOCATION, 0L);
-  curl_easy_setopt(easy, CURLOPT_NETRC, static_cast<long>(CURL_NETRC_IGNORED));
-  curl_easy_setopt(easy, CURLOPT_PROXY, "");  // nor one from the environment
-  curl_easy_setopt(easy, CURLOPT_NOSIGNAL, 1L);
-  curl_easy_setopt(easy, CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
-  curl_easy_setopt(easy, CURLOPT_OPENSOCKETFUNCTION, openSocket);
-  curl_easy_setopt(easy, CURLOPT_ERRORBUFFER, _error.data());
-  curl_easy_setopt(easy, CURLOPT_WRITEFUNCTION, takeBody);
-  curl_easy_setopt(easy, CURLOPT_WRITEDATA, this);
-  curl_easy_setopt(easy, CURLOPT_HEADERFUNCTION, takeHeader);
-  curl_easy_setopt(easy, CURLOPT_HEADERDATA, this);
+  _curl->easySetopt(easy, CURLOPT_PROTOCOLS_STR, "https");
+  _curl->easySetopt(easy, CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
+  _curl->easySetopt(easy, CURLOPT_FOLLOWLOCATION, 0L);
+  _curl->easySetopt(easy, CURLOPT_NETRC, static_cast<long>(CURL_NETRC_IGNORED));
+  _curl->easySetopt(easy, CURLOPT_PROXY, "");  // nor one from the environment
+  _curl->easySetopt(easy, CURLOPT_NOSIGNAL, 1L);
+  _curl->easySetopt(easy, CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
+  _curl->easySetopt(easy, CURLOPT_OPENSOCKETFUNCTION, openSocket);
+  _curl->easySetopt(easy, CURLOPT_ERRORBUFFER, _error.data());
+  _curl->easySetopt(easy, CURLOPT_WRITEFUNCTION, takeBody);
+  _curl->easySetopt(easy, CURLOPT_WRITEDATA, this);
+  _curl->easySetopt(easy, CURLOPT_HEADERFUNCTION, takeHeader);
+  _curl->easySetopt(easy, CURLOPT_HEADERDATA, this);
   setBody(easy);
   setLimits(easy, now);
   setTrust(easy, trust);
@@ -102,10 +103,10 @@ bool CurlTransfer::setHeaders(CURL* easy) {
   // What libcurl would add by itself, unless the request has its own.
   std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
   const auto append = [this](const std::string& line) {
-    curl_slist* longer = curl_slist_append(_headerList.get(), line.c_str());
+    curl_slist* longer = _curl->slistAppend(_headerList.get(), line.c_str());
     if (longer == nullptr) return false;
     (void)_headerList.release();
-    _headerList.reset(longer);
+    _headerList = HeaderList(longer, _curl->slistFreeAll);
     return true;
   };
   for (const auto& [name, value] : _request.headers) {
@@ -118,42 +119,42 @@ bool CurlTransfer::setHeaders(CURL* easy) {
   for (const auto& [automatic, found] : own) {
     if (!found && !append(std::string(automatic) + ":")) return false;
   }
-  return append("Expect:") && curl_easy_setopt(easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
+  return append("Expect:") && _curl->easySetopt(easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
 }
 
 void CurlTransfer::setBody(CURL* easy) {
   if (_request.method == HTTPRequest::Method::get) {
-    curl_easy_setopt(easy, CURLOPT_HTTPGET, 1L);
+    _curl->easySetopt(easy, CURLOPT_HTTPGET, 1L);
     return;
   }
-  curl_easy_setopt(easy, CURLOPT_POST, 1L);
-  curl_easy_setopt(easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
-  curl_easy_setopt(easy, CURLOPT_POSTFIELDS, _request.body.data());  // not copied
+  _curl->easySetopt(easy, CURLOPT_POST, 1L);
+  _curl->easySetopt(easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
+  _curl->easySetopt(easy, CURLOPT_POSTFIELDS, _request.body.data());  // not copied
 }
 
 void CurlTransfer::setLimits(CURL* easy, Time now) {
-  curl_easy_setopt(easy, CURLOPT_CONNECTTIMEOUT, kConnectSeconds);
+  _curl->easySetopt(easy, CURLOPT_CONNECTTIMEOUT, kConnectSeconds);
   if (_deadline) {
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(*_deadline - now).count();
-    curl_easy_setopt(easy, CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would be no limit at all
+    _curl->easySetopt(easy, CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would be no limit at all
     return;
   }
-  curl_easy_setopt(easy, CURLOPT_LOW_SPEED_LIMIT, static_cast<long>(_request.leastBytesPerSecond));
-  curl_easy_setopt(easy, CURLOPT_LOW_SPEED_TIME, kLowSpeedSeconds);
+  _curl->easySetopt(easy, CURLOPT_LOW_SPEED_LIMIT, static_cast<long>(_request.leastBytesPerSecond));
+  _curl->easySetopt(easy, CURLOPT_LOW_SPEED_TIME, kLowSpeedSeconds);
 }
 
 void CurlTransfer::setTrust(CURL* easy, TrustStore& trust) {
-  curl_easy_setopt(easy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
-  curl_easy_setopt(easy, CURLOPT_SSL_VERIFYPEER, 1L);
-  curl_easy_setopt(easy, CURLOPT_SSL_VERIFYHOST, 2L);
-  curl_easy_setopt(easy, CURLOPT_SSL_SESSIONID_CACHE, 0L);  // every connection has its certificate checked
+  _curl->easySetopt(easy, CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+  _curl->easySetopt(easy, CURLOPT_SSL_VERIFYPEER, 1L);
+  _curl->easySetopt(easy, CURLOPT_SSL_VERIFYHOST, 2L);
+  _curl->easySetopt(easy, CURLOPT_SSL_SESSIONID_CACHE, 0L);  // every connection has its certificate checked
   // The shared store alone: libcurl would load its own for each connection, and its cache would keep ours
   // when it has been replaced.
-  curl_easy_setopt(easy, CURLOPT_CA_CACHE_TIMEOUT, 0L);
-  curl_easy_setopt(easy, CURLOPT_CAINFO, nullptr);
-  curl_easy_setopt(easy, CURLOPT_CAPATH, nullptr);
-  curl_easy_setopt(easy, CURLOPT_SSL_CTX_FUNCTION, setStore);
-  curl_easy_setopt(easy, CURLOPT_SSL_CTX_DATA, &trust);
+  _curl->easySetopt(easy, CURLOPT_CA_CACHE_TIMEOUT, 0L);
+  _curl->easySetopt(easy, CURLOPT_CAINFO, nullptr);
+  _curl->easySetopt(easy, CURLOPT_CAPATH, nullptr);
+  _curl->easySetopt(easy, CURLOPT_SSL_CTX_FUNCTION, setStore);
+  _curl->easySetopt(easy, CURLOPT_SSL_CTX_DATA, &trust);
 }
 
 bool CurlTransfer::admits(std::size_t more) {
@@ -181,10 +182,10 @@ HTTPResult CurlTransfer::result(CURLcode code, CURL* easy) {
   if (code != CURLE_OK) return Failure{HTTPError{HTTPError::Kind::transport, describe(code)}};
   HTTPResponse response;
   long status = 0;
-  curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+  _curl->easyGetinfo(easy, CURLINFO_RESPONSE_CODE, &status);
   response.status = static_cast<int>(status);
   curl_header* header = nullptr;  // libcurl leaves the line break of an empty value
-  while ((header = curl_easy_nextheader(easy, CURLH_HEADER, -1, header)) != nullptr) {
+  while ((header = _curl->easyNextheader(easy, CURLH_HEADER, -1, header)) != nullptr) {
     std::string value = header->value;
     while (!value.empty() && (isControl(value.back()) || value.back() == ' ')) value.pop_back();
     response.headers.emplace_back(header->name, std::move(value));
@@ -200,7 +201,7 @@ std::string CurlTransfer::describe(CURLcode code) const {
   if (_received > _request.mostResponseBytes) {
     return "The answer is larger than " + std::to_string(_request.mostResponseBytes) + " bytes";
   }
-  std::string text = _error[0] != '\0' ? _error.data() : curl_easy_strerror(code);
+  std::string text = _error[0] != '\0' ? _error.data() : _curl->easyStrerror(code);
   while (!text.empty() && isControl(text.back())) text.pop_back();
   std::replace_if(text.begin(), text.end(), isControl, ' ');
   return text;

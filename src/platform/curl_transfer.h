@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/curl_library.h"
 #include "platform/http_client.h"
 #include "platform/trust_store.h"
 
@@ -38,18 +39,17 @@ class CurlTransfer {
   const std::optional<HTTPError>& refused() const { return _refused; }
 
   // Sets `easy` up, which is fresh or reset. False: libcurl has no memory for it.
-  bool attach(CURL* easy, TrustStore& trust, Time now);
+  bool attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust, Time now);
   // What libcurl's verdict means; reads the attached handle.
   HTTPResult result(CURLcode code, CURL* easy);
   HTTPError timedOutWaiting() const;
+  static HTTPError stopping() { return {HTTPError::Kind::stopping, "The daemon is stopping"}; }
 
   // Once, without any lock; lets the completion go.
   void complete(HTTPResult result);
 
  private:
-  struct FreeList {
-    void operator()(curl_slist* list) const { curl_slist_free_all(list); }
-  };
+  using HeaderList = std::unique_ptr<curl_slist, decltype(&::curl_slist_free_all)>;
 
   bool setHeaders(CURL* easy);
   void setBody(CURL* easy);
@@ -69,7 +69,8 @@ class CurlTransfer {
   const std::optional<Time> _deadline;  // none: a least speed holds instead
   std::optional<HTTPError> _refused;
 
-  std::unique_ptr<curl_slist, FreeList> _headerList;
+  const CurlLibrary* _curl = nullptr;
+  HeaderList _headerList{nullptr, nullptr};
   std::array<char, CURL_ERROR_SIZE> _error{};
   std::string _body;
   std::size_t _received = 0;  // header and body bytes

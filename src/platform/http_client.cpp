@@ -95,8 +95,7 @@ void CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
 }
 
 HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
-  if (_impl->inbox.blockingFails())
-    return Failure{HTTPError{HTTPError::Kind::stopping, "The daemon is stopping"}};
+  if (_impl->inbox.blockingFails()) return Failure{CurlTransfer::stopping()};
   const auto answer =
       std::make_shared<Answer>();  // the giver may still be at its lock when the waiter has gone
   _impl->file(

@@ -8,37 +8,31 @@
 
 namespace veltrad::platform {
 
-namespace {
-
-const HTTPError kStopping{HTTPError::Kind::stopping, "The daemon is stopping"};
-
-// libcurl counts these, so each client has its own pair.
-CURLM* makeMulti() {
-  if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) std::abort();
-  CURLM* multi = curl_multi_init();
-  if (multi == nullptr) std::abort();
-  curl_multi_setopt(multi, CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
-  curl_multi_setopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPWaiting::kConnections));
-  curl_multi_setopt(multi, CURLMOPT_MAXCONNECTS, 8L);  // kept alive
-  return multi;
-}
-
-}  // namespace
-
 HTTPWorker::HTTPWorker(HTTPInbox& inbox, std::string extraCertificatesPath)
     : _inbox(inbox),
       _multi(makeMulti()),
-      _wakeable(curl_multi_wakeup(_multi) == CURLM_OK),  // not without descriptors
+      _wakeable(_curl.multiWakeup(_multi) == CURLM_OK),  // not without descriptors
       _trust(std::move(extraCertificatesPath)) {}
 
+CURLM* HTTPWorker::makeMulti() const {
+  if (_curl.globalInit(CURL_GLOBAL_DEFAULT) != CURLE_OK)
+    std::abort();  // counted: each client has its own pair
+  CURLM* multi = _curl.multiInit();
+  if (multi == nullptr) std::abort();
+  _curl.multiSetopt(multi, CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
+  _curl.multiSetopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPWaiting::kConnections));
+  _curl.multiSetopt(multi, CURLMOPT_MAXCONNECTS, 8L);  // kept alive
+  return multi;
+}
+
 HTTPWorker::~HTTPWorker() {
-  for (CURL* easy : _idleHandles) curl_easy_cleanup(easy);
-  curl_multi_cleanup(_multi);
-  curl_global_cleanup();
+  for (CURL* easy : _idleHandles) _curl.easyCleanup(easy);
+  _curl.multiCleanup(_multi);
+  _curl.globalCleanup();
 }
 
 void HTTPWorker::wake() {
-  curl_multi_wakeup(_multi);
+  _curl.multiWakeup(_multi);
 }
 
 void HTTPWorker::run() {
@@ -52,7 +46,7 @@ void HTTPWorker::run() {
     else if (taken.failBlocking)
       end([](const CurlTransfer& transfer) { return transfer.blocking(); });
     int running = 0;
-    curl_multi_perform(_multi, &running);
+    _curl.multiPerform(_multi, &running);
     finish();
     endExpired();
     startNext();
@@ -78,13 +72,13 @@ void HTTPWorker::end(const HTTPWaiting::Predicate& matches) {
       ++at;
       continue;
     }
-    curl_multi_remove_handle(_multi, at->first);
+    _curl.multiRemoveHandle(_multi, at->first);
     keepHandle(at->first);
     _waiting.ended(*at->second);
     ending.push_back(std::move(at->second));
     at = _running.erase(at);
   }
-  for (Transfer& transfer : ending) complete(std::move(transfer), Failure{kStopping});
+  for (Transfer& transfer : ending) complete(std::move(transfer), Failure{CurlTransfer::stopping()});
 }
 
 void HTTPWorker::startNext() {
@@ -92,10 +86,11 @@ void HTTPWorker::startNext() {
 }
 
 void HTTPWorker::startOne(Transfer transfer) {
-  CURL* easy = _idleHandles.empty() ? curl_easy_init() : _idleHandles.back();
+  CURL* easy = _idleHandles.empty() ? _curl.easyInit() : _idleHandles.back();
   if (!_idleHandles.empty()) _idleHandles.pop_back();
-  const bool ready = easy != nullptr && transfer->attach(easy, _trust, std::chrono::steady_clock::now()) &&
-                     curl_multi_add_handle(_multi, easy) == CURLM_OK;
+  const bool ready = easy != nullptr &&
+                     transfer->attach(_curl, easy, _trust, std::chrono::steady_clock::now()) &&
+                     _curl.multiAddHandle(_multi, easy) == CURLM_OK;
   if (ready) {
     _running.emplace(easy, std::move(transfer));
     return;
@@ -103,12 +98,12 @@ void HTTPWorker::startOne(Transfer transfer) {
   if (easy != nullptr) keepHandle(easy);
   _waiting.ended(*transfer);
   complete(std::move(transfer),
-           Failure{HTTPError{HTTPError::Kind::transport, curl_easy_strerror(CURLE_OUT_OF_MEMORY)}});
+           Failure{HTTPError{HTTPError::Kind::transport, _curl.easyStrerror(CURLE_OUT_OF_MEMORY)}});
 }
 
 void HTTPWorker::finish() {
   int left = 0;
-  while (const CURLMsg* message = curl_multi_info_read(_multi, &left)) {
+  while (const CURLMsg* message = _curl.multiInfoRead(_multi, &left)) {
     if (message->msg != CURLMSG_DONE) continue;
     CURL* easy = message->easy_handle;
     const CURLcode code = message->data.result;
@@ -116,7 +111,7 @@ void HTTPWorker::finish() {
     Transfer transfer = std::move(found->second);
     _running.erase(found);
     HTTPResult result = transfer->result(code, easy);
-    curl_multi_remove_handle(_multi, easy);
+    _curl.multiRemoveHandle(_multi, easy);
     keepHandle(easy);
     _waiting.ended(*transfer);
     complete(std::move(transfer), std::move(result));
@@ -137,7 +132,7 @@ void HTTPWorker::poll() {
   constexpr int kCheckWaiting = 1000, kUnwoken = 100,
                 kIdle = 3'600'000;  // ms; libcurl's own timers come first
   const int most = !_wakeable ? kUnwoken : _waiting.empty() ? kIdle : kCheckWaiting;
-  curl_multi_poll(_multi, nullptr, 0, most, nullptr);
+  _curl.multiPoll(_multi, nullptr, 0, most, nullptr);
 }
 
 void HTTPWorker::complete(Transfer transfer, HTTPResult result) {
@@ -147,11 +142,11 @@ void HTTPWorker::complete(Transfer transfer, HTTPResult result) {
 }
 
 void HTTPWorker::keepHandle(CURL* easy) {
-  curl_easy_reset(easy);
+  _curl.easyReset(easy);
   if (_idleHandles.size() < kIdleHandles)
     _idleHandles.push_back(easy);
   else
-    curl_easy_cleanup(easy);
+    _curl.easyCleanup(easy);
 }
 
 }  // namespace veltrad::platform

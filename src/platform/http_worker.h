@@ -8,6 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
+#include "platform/curl_library.h"
 #include "platform/curl_transfer.h"
 #include "platform/http_inbox.h"
 #include "platform/http_waiting.h"
@@ -32,6 +33,7 @@ class HTTPWorker {
   using Transfer = std::unique_ptr<CurlTransfer>;
   static constexpr std::size_t kIdleHandles = 8;
 
+  CURLM* makeMulti() const;
   void arrive(std::vector<Transfer> transfers);
   void end(const HTTPWaiting::Predicate& matches);
   void startNext();
@@ -44,6 +46,7 @@ class HTTPWorker {
 
   // constant after construction
   HTTPInbox& _inbox;
+  const CurlLibrary _curl;
   CURLM* const _multi;
   const bool _wakeable;
 
