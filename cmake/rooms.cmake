@@ -9,7 +9,12 @@ target_compile_options(veltra_options INTERFACE
   $<$<COMPILE_LANG_AND_ID:CXX,Clang>:-Wthread-safety -Wthread-safety-beta>)
 if(VELTRA_SANITIZE)
   target_compile_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE} -fno-sanitize-recover=all -O1 -g1)
+  target_compile_options(veltra_options INTERFACE
+    $<$<CXX_COMPILER_ID:Clang>:-fsanitize-ignorelist=${PROJECT_SOURCE_DIR}/cmake/sanitizer_ignorelist.txt>)
   target_link_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE})
+endif()
+if(VELTRA_FUZZ)
+  target_compile_options(veltra_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 target_link_libraries(veltra_options INTERFACE Threads::Threads)
 

@@ -88,7 +88,7 @@ class CAPABILITY("mutex") Mutex {
  private:
   friend class Condition;
   std::mutex _mutex;
-  const LockRank _rank;
+  [[maybe_unused]] const LockRank _rank;  // of use in debug builds alone
 };
 
 // The same thread may take it again. Analysed like a Mutex: a function that may hold it already says so with
@@ -114,7 +114,7 @@ class CAPABILITY("mutex") RecursiveMutex {
 
  private:
   std::recursive_mutex _mutex;
-  const LockRank _rank;
+  [[maybe_unused]] const LockRank _rank;  // of use in debug builds alone
 };
 
 template <typename M>

@@ -1,0 +1,31 @@
+// Equality for round trips: as Value's, but not-a-number equals itself. Any thread.
+#pragma once
+
+#include <algorithm>
+#include <cmath>
+
+#include "base/value.h"
+
+namespace veltrad::fuzz {
+
+inline bool same(double a, double b) {
+  return a == b || (std::isnan(a) && std::isnan(b));
+}
+
+inline bool same(const Value& a, const Value& b) {
+  if (a.asReal() && b.asReal()) return same(*a.asReal(), *b.asReal());
+  if (a.asDate() && b.asDate()) return same(a.asDate()->secondsSince1970, b.asDate()->secondsSince1970);
+  if (a.asArray() && b.asArray()) {
+    return std::equal(a.asArray()->begin(), a.asArray()->end(), b.asArray()->begin(), b.asArray()->end(),
+                      [](const Value& x, const Value& y) { return same(x, y); });
+  }
+  if (a.asDictionary() && b.asDictionary()) {
+    return std::equal(a.asDictionary()->begin(), a.asDictionary()->end(), b.asDictionary()->begin(),
+                      b.asDictionary()->end(), [](const auto& x, const auto& y) {
+                        return x.first == y.first && same(x.second, y.second);
+                      });
+  }
+  return a == b;
+}
+
+}  // namespace veltrad::fuzz
