@@ -114,6 +114,11 @@ void Server::Library::route() {
   http.set_keep_alive_timeout(60);
   http.set_payload_max_length(kMostBodyBytes);
   http.set_tcp_nodelay(true);
+  // The library's own choice would let a second lab share the port.
+  http.set_socket_options([](socket_t socket) {
+    const int yes = 1;
+    ::setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
+  });
   http.set_exception_handler([](const Request&, Response& response, std::exception_ptr) {
     refuse(response, 500, "the lab could not handle this request");
   });
