@@ -64,6 +64,7 @@ int main(int count, char** arguments) {
         given.outcome.done ? given.outcome.text : "veltra-storebag: " + given.outcome.text + "\n";
     const bool written =
         std::fwrite(text.data(), 1, text.size(), stream) == text.size() && std::fflush(stream) == 0;
+    if (!written && given.outcome.done) std::perror("veltra-storebag: standard output");
     return given.outcome.done && written ? 0 : 1;
   } catch (const std::exception& error) {
     std::fprintf(stderr, "veltra-storebag: %s\n", error.what());
