@@ -12,7 +12,6 @@ import socket
 import ssl
 import struct
 import subprocess
-import sys
 import tempfile
 import threading
 import time
@@ -334,8 +333,8 @@ class Wire:
                 return frame[2]
         return None
 
-    def describe(self, client_type=7):
-        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=False,
+    def describe(self, client_type=7, aggregates=False):
+        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=aggregates,
                          sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True},
                          userInfo={"clientName": "phone", "serviceName": "ringer"}, frameworksToCheck=[])
 
@@ -376,11 +375,11 @@ class SystemTest(unittest.TestCase):
         yield daemon
         daemon.stop()
 
-    def open(self, *arguments, **options):
+    def open(self, *arguments, deadline=DEADLINE, **options):
         """A session that has been started, and what its start answered."""
         ctl = Ctl(self.root, *arguments, **options)
         self.addCleanup(ctl.kill)
-        answer = ctl.answer()
+        answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]
 

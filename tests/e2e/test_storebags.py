@@ -2,7 +2,7 @@
 import concurrent.futures
 import time
 
-from harness import SystemTest, closed_port, storebag
+from harness import Ctl, SystemTest, closed_port, storebag
 
 FAILED = "fetchAndCacheStorebag: Unable to fetch storebag for client type "
 SECTION = "fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type "
@@ -126,7 +126,8 @@ class Stalled(SystemTest):
     def test_nobody_waits_for_a_server_that_he_did_not_ask_for(self):
         self.lab.control(path="/storebags/maple/ostvane", stall=True)
         with self.serving() as daemon:
-            waiting = self.start(6)
+            waiting = Ctl(self.root, 6)
+            self.addCleanup(waiting.kill)
             self.lab.storebags(1)
             session, backends = self.open(7)
             self.assertEqual(backends, ["httppost"])
@@ -139,16 +140,10 @@ class Stalled(SystemTest):
             self.lab.reset()
             self.assertEqual(waiting.answer()["backends"], ["httppost"])
 
-    def start(self, client_type):
-        from harness import Ctl
-        ctl = Ctl(self.root, client_type)
-        self.addCleanup(ctl.kill)
-        return ctl
-
     def test_gives_up_after_15_seconds(self):
         self.lab.control(path="/storebags", stall=True)
         with self.serving(FAILED, SECTION) as daemon:
             begin = time.monotonic()
-            self.assertIsNone(self.start(6).answer(25)["backends"])
+            self.assertIsNone(self.open(6, deadline=25)[1])
             self.assertAlmostEqual(time.monotonic() - begin, 15, delta=2)
             daemon.wait_for_line(UNRESOLVED)
