@@ -143,7 +143,8 @@ class Lab:
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-lab-"))
         if Lab._keys:
             shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True)
-        self.process = Process([program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments], None, "stdout")
+        command = [program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments]
+        self.process = Process(command, None, "stdout")
         line = json.loads(self.process.wait_for(lambda lines: lines and lines[0], "the lab's first line"))
         self.url, self.certificate, self.public_key = line["url"], line["certificate"], line["publicKey"]
         self.port = int(self.url.rsplit(":", 1)[1])
@@ -182,7 +183,8 @@ class Lab:
         os.utime(path, (time.time() - age,) * 2)
 
     def received(self, kind, count=0, deadline=DEADLINE):
-        lines = self.request("GET", f"/received?kind={kind}&count={count}&waitMs={int(deadline * 1000)}")[1].splitlines()
+        path = f"/received?kind={kind}&count={count}&waitMs={int(deadline * 1000)}"
+        lines = self.request("GET", path)[1].splitlines()
         if len(lines) < count:
             raise AssertionError(f"{len(lines)} of {count} {kind} came within {deadline} s: {lines}")
         return [json.loads(line) for line in lines]
@@ -334,7 +336,8 @@ class Wire:
         return None
 
     def describe(self, client_type=7, aggregates=False):
-        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=aggregates,
+        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:",
+                         hasAggregationBlock=aggregates,
                          sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True},
                          userInfo={"clientName": "phone", "serviceName": "ringer"}, frameworksToCheck=[])
 

@@ -1,7 +1,8 @@
 #!/usr/bin/env python3
-"""Runs the tests with real processes: all of them, or those named (test_road, test_road.ThinRoad.test_batch).
-VELTRA_BUILD is the build directory, build/dev by default. The last line is "N passed, N failed"; status 1 when any
-failed. One process for each class, two at a time."""
+"""Runs the tests with real processes: all of them, or those named (road, test_road.Road.test_examples).
+
+VELTRA_BUILD is the build directory, build/dev by default. One process for each class, two at a time. The last line is
+"N passed, N failed"; the status is 1 when any failed."""
 import concurrent.futures
 import os
 import pathlib
@@ -29,7 +30,8 @@ def run_here(names):
 
 def run_apart(names):
     begin = time.monotonic()
-    done = subprocess.run([sys.executable, __file__, "--here", *names], stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+    done = subprocess.run([sys.executable, __file__, "--here", *names], stdout=subprocess.PIPE,
+                          stderr=subprocess.STDOUT)
     *lines, last = done.stdout.decode("utf-8", "replace").rstrip("\n").split("\n")
     if last.startswith("RESULT "):
         passed, failed = map(int, last.split()[1:])
@@ -39,6 +41,7 @@ def run_apart(names):
 
 
 def main(names):
+    names = [name if name.startswith("test_") else "test_" + name for name in names]
     names = names or sorted(path.stem for path in HERE.glob("test_*.py"))
     classes = {}
     for test in leaves(unittest.defaultTestLoader.loadTestsFromNames(names)):

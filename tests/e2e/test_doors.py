@@ -38,8 +38,8 @@ class Doors(SystemTest):
             lines = [line for line in daemon.text if "listener: Accepting" in line]
             self.assertEqual(lines[1], accepted)
             for line, count in zip(lines, (0, 1)):
-                self.assertRegex(line, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper entitlement, "
-                                       rf"{count}\(0\) connections\.$")
+                self.assertRegex(line, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper "
+                                       rf"entitlement, {count}\(0\) connections\.$")
             first.send(Wire.CALL, b"no property list", call=7)
             kind, call, body = first.frame()
             self.assertEqual((kind, call), (Wire.REPLY, 7))

@@ -35,7 +35,8 @@ class Road(SystemTest):
         self.assertEqual(set(post["body"]), {"postTime", "clientId", "events"})
         self.assertAlmostEqual(post["body"]["postTime"], time.time(), delta=120)
         self.assertEqual(len(post["body"]["clientId"]), 36)
-        headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer", "User-Agent": "Veltra/8.0 (Elm4,2; 12.1)",
+        headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer",
+                   "User-Agent": "Veltra/8.0 (Elm4,2; 12.1)",
                    "X-VLT-Client-Version": "3", "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2",
                    "Accept": "application/json", "Content-Type": "application/json",
                    "Content-Length": str(post["bytes"])}
@@ -74,10 +75,10 @@ class Road(SystemTest):
             self.assertEqual(error, {"domain": "com.florn.veltra.error", "code": 503,
                                      "description": "backend httppost disabled by server 503 return code"})
             self.assertIsNone(session.send()["reply"])
-            self.assertEqual(session.ask("states", userInfo={"clientName": "phone", "serviceName": "ringer"})["backends"], [])
-            # A changed identity has the states computed anew.
-            self.assertEqual(session.ask("states", userInfo={"clientName": "phone", "serviceName": "bell"})["backends"],
-                             ["httppost"])
+            # Only a changed identity has the states computed anew.
+            for service, backends in (("ringer", []), ("bell", ["httppost"])):
+                states = session.ask("states", userInfo={"clientName": "phone", "serviceName": service})
+                self.assertEqual(states["backends"], backends)
 
     def test_aggregating_client_gets_copies(self):
         with self.serving("Failed to get remote object proxy: "):  # for the copies of the session's end
@@ -89,7 +90,8 @@ class Road(SystemTest):
             copies = [client.frame() for _ in range(2)]
             client.close()
         for (kind, call, body), (category, type) in zip(copies, ((0, 0), (5, 2))):
-            self.assertEqual((kind, call, body["op"]), (Wire.EVENT, 0, "sendMessageToClient:timestamp:category:type:payload:"))
+            self.assertEqual((kind, call, body["op"]),
+                             (Wire.EVENT, 0, "sendMessageToClient:timestamp:category:type:payload:"))
             self.assertEqual((body["args"]["category"], body["args"]["type"]), (category, type))
         last = copies[1][2]["args"]
         self.assertEqual(last["payload"], {"codec": "opus", "clientName": "phone", "serviceName": "ringer"})

@@ -22,7 +22,8 @@ class Cache(SystemTest):
             self.assertNotIn("If-Modified-Since", request["headers"])
             self.assertEqual(self.open(2)[1], None)  # a client type without storebag, and without a download
             daemon.allow("Could not find storebag name for client type 2")
-            daemon.wait_for_line("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type 2")
+            daemon.wait_for_line("<3>fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client "
+                                 "type 2")
             self.assertEqual(len(self.lab.storebags()), 1)
 
     def test_lifetimes(self):
@@ -54,7 +55,9 @@ class Conditional(SystemTest):
             session.send()
             session.close()
             self.assertEqual(self.lab.wait_for_events(1, _status=1, _method=0)[0]["StorebagVersion"], "v2")
-            self.assertEqual(second["headers"]["If-Modified-Since"], self.lab.storebags(3)[2]["headers"]["If-Modified-Since"])
+            third = self.lab.storebags(3)[2]
+            self.assertEqual(third["outcome"], "200")
+            self.assertEqual(third["headers"]["If-Modified-Since"], second["headers"]["If-Modified-Since"])
             # Not modified, but without the date: a failure, and the section stays.
             self.lab.control(path="/storebags", lastModified=False)
             daemon.allow("fetchStorebagWithName: Signature is missing", "propertyListWithData error", FAILED, SECTION)
@@ -68,14 +71,16 @@ class Conditional(SystemTest):
 
 class Untrusted(SystemTest):
     def test_what_is_not_signed_is_not_used(self):
-        unverified, missing = "fetchStorebagWithName: Signature can not be verified, ", "fetchStorebagWithName: Signature is missing"
+        unverified = "fetchStorebagWithName: Signature can not be verified, "
+        missing = "fetchStorebagWithName: Signature is missing"
+        unreadable = "fetchStorebagWithName: propertyListWithData error "
         table = [(5, "pellmarch", {"sign": "wrong"}, unverified), (6, "ostvane", {"sign": "missing"}, missing),
                  (7, "quindle", {"sign": "none"}, missing), (8, "brevatto", {"body": "no property list"}, missing),
                  (9, "sollwick", {"body": "bplist00" + "\x7f" * 64}, missing),
                  (10, "tamberlin", {"status": 500, "body": ""}, missing),
-                 (12, "crovish", {"body": "<plist version='1.0'><dict><key>signature</key><string>AAAA</string><key>bag</key>"
-                                          "<string>!</string></dict></plist>"}, None)]
-        with self.serving(unverified, missing, FAILED, SECTION, "fetchStorebagWithName: propertyListWithData error ") as daemon:
+                 (12, "crovish", {"body": "<plist version='1.0'><dict><key>signature</key><string>AAAA</string>"
+                                          "<key>bag</key><string>!</string></dict></plist>"}, None)]
+        with self.serving(unverified, missing, unreadable, FAILED, SECTION) as daemon:
             for count, (client_type, name, rule, line) in enumerate(table, 1):
                 with self.subTest(**rule):
                     self.lab.put(name, storebag())
@@ -101,7 +106,8 @@ class Servers(SystemTest):
         daemon.wait_for_line("fetchAndCacheStorebag: Storebag max age: 3600 seconds")
 
     def test_unreachable(self):
-        for url in (f"https://localhost:{closed_port()}/bags", "https://no-such-host.invalid/bags", "http://localhost/bags"):
+        for url in (f"https://localhost:{closed_port()}/bags", "https://no-such-host.invalid/bags",
+                    self.lab.url.replace("https", "http")):
             with self.subTest(url):
                 self.root.prefer(veltra_storebag_url=url)
                 with self.serving(*self.allowed) as daemon:

@@ -93,7 +93,8 @@ class Hostile(SystemTest):
         client = Wire(self.root)
         dictionary = lambda value: plistlib.dumps(value, fmt=plistlib.FMT_BINARY)
         bodies = {"no property list": b"x" * 100, "empty": b"", "an array": dictionary([1]), "too deep": deep(5000),
-                  "unknown operation": dictionary({"op": "dance", "args": {}}), "no operation": dictionary({"args": {}}),
+                  "unknown operation": dictionary({"op": "dance", "args": {}}),
+                  "no operation": dictionary({"args": {}}),
                   "operation that is a number": dictionary({"op": 5, "args": {}}),
                   "arguments of the wrong type": dictionary({"op": SEND, "args": {"category": "five", "type": [1]}}),
                   "XML": plistlib.dumps({"op": SEND, "args": {}})[:1000]}
