@@ -96,6 +96,7 @@ TEST(Interrupt, endsAWaitForALine) {
     Interrupt interrupt;
     Pipe pipe;
     LineReader lines(pipe.reading.get(), 8, interrupt);
+    interrupt.begin();
     pthread_kill(pthread_self(), SIGINT);
     EXPECT_EQ(lines.next(), Got::interrupted);
     EXPECT_EQ(interrupt.wait(-1, std::chrono::hours(1)), Interrupt::Wake::interrupted);

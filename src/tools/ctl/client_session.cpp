@@ -64,7 +64,10 @@ std::optional<std::string> ClientSession::open(const std::optional<std::string>&
   veltra_status status = VELTRA_OK;
   char* error = nullptr;
   _session = veltra_session_create(&options, &status, &error);
-  if (_session) return std::nullopt;
+  if (_session) {
+    _interrupt.begin();
+    return std::nullopt;
+  }
   std::string text = error ? error : veltra_status_text(status);
   veltra_free(error);
   return text;

@@ -1,4 +1,5 @@
-// Waits that the user can end. Own thread only (the one that makes it, before any other starts).
+// Waits that the user can end. Own thread only; every other thread must have the signals blocked, as the
+// library's do.
 #include "tools/ctl/interrupt.h"
 
 #include <poll.h>
@@ -22,7 +23,7 @@ sigset_t endingSignals() {
 
 }  // namespace
 
-Interrupt::Interrupt() {
+void Interrupt::begin() {
   const sigset_t set = endingSignals();
   _signals = platform::FileDescriptor(signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK));
   // Without the descriptor the signals keep ending the process.

@@ -1,4 +1,5 @@
-// Waits that the user can end. Own thread only (the one that makes it, before any other starts).
+// Waits that the user can end. Own thread only; every other thread must have the signals blocked, as the
+// library's do.
 #pragma once
 
 #include <chrono>
@@ -8,11 +9,11 @@
 
 namespace veltrad::ctl {
 
-// Takes SIGINT and SIGTERM as an event to wait for instead of the end of the process: threads started later
-// inherit that. After the first one both end the process again, so a second one always does.
+// Until begin(), SIGINT and SIGTERM end the process as ever. From then on the first one ends a wait, and
+// after it both end the process again.
 class Interrupt {
  public:
-  Interrupt();
+  void begin();
 
   enum class Wake { ready, timeout, interrupted };
   // Until `descriptor` can be read (or has ended or failed), the time is over, or a signal has come. No time:

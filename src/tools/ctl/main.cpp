@@ -16,7 +16,7 @@ int main(int argc, char** argv) {
   }
   const Options& options = std::get<Options>(parsed);
   if (options.command == Command::stats) return runStats(options);
-  Interrupt interrupt;  // before the library starts its threads
+  Interrupt interrupt;
   return options.command == Command::session ? runSession(options, interrupt)
                                              : runOneCall(options, interrupt);
 }

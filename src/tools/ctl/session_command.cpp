@@ -54,7 +54,7 @@ class SessionRun {
   // The exit status when nothing else speaks against 0.
   int end() const {
     if (_unanswered == 0) return 0;
-    complain(fmt::format("{} calls ended without an answer.", _unanswered));
+    complain(fmt::format("Calls that ended without an answer: {}.", _unanswered));
     return 1;
   }
 
@@ -131,7 +131,8 @@ int runSession(const Options& options, Interrupt& interrupt) {
   const Ended refused = run.start();
   LineReader lines(options.input ? file.get() : STDIN_FILENO, kLongestLine, interrupt);
   const int status = refused ? *refused : runLines(run, lines);
-  if (const std::uint64_t lost = session.close()) complain(fmt::format("{} calls were lost unsent.", lost));
+  if (const std::uint64_t lost = session.close())
+    complain(fmt::format("Calls that were lost unsent: {}.", lost));
   return status;
 }
 
