@@ -146,6 +146,13 @@ class Stop(SystemTest):
             self.lab.wait_for_events(1, after=True)
             self.assertNotIn("<7>dealloc: VeltradSession dealloc: 2", daemon.text)
 
+    def test_client_outlives_the_daemon(self):
+        daemon = self.daemon()
+        session, _ = self.open()
+        daemon.kill()
+        session.send()
+        self.assertEqual(session.end(), 1)
+
     def test_two_signals_end_it_at_once(self):
         self.lab.control(path="/events", stall=True)
         daemon = self.daemon()

@@ -1,5 +1,6 @@
 """From a client's message to the collector."""
 import json
+import plistlib
 import subprocess
 import time
 
@@ -79,6 +80,38 @@ class Road(SystemTest):
             for service, backends in (("ringer", []), ("bell", ["httppost"])):
                 states = session.ask("states", userInfo={"clientName": "phone", "serviceName": service})
                 self.assertEqual(states["backends"], backends)
+
+    def test_consent_and_identifier(self):
+        """Nothing leaves without consent; the identifier outlives the daemon."""
+        self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+        with self.serving():
+            session, backends = self.open()
+            self.assertEqual((backends, session.send()["reply"]), ([], None))
+            session.close()
+        self.assertEqual(self.lab.received("events"), [])
+        self.root.preferences = plistlib.loads(
+            (self.root.path / "var/lib/veltrad/preferences/com.florn.veltra.plist").read_bytes())
+        self.root.prefer(DiagnosticLogSubmissionEnabled=True)
+        for _ in range(2):
+            with self.serving():
+                self.open()
+        self.assertEqual(len({post["body"]["clientId"] for post in self.lab.received("events", 4)}), 1)
+
+    def test_hundred_sessions_at_once(self):
+        with self.serving() as daemon:
+            clients = [Wire(self.root) for _ in range(100)]
+            for number, client in enumerate(clients):
+                client.describe()
+                client.send(Wire.CALL, {"op": "startConfigWithCompletionHandler:", "args": {}})
+                client.send(Wire.CALL, {"op": "sendMessageWithDictionary:reply:", "args": {
+                    "message": {"category": 5, "type": 2, "payload": {"number": number}}}})
+            self.lab.wait_for_events(100, _method=5)
+            self.assertEqual(sorted(e["number"] for e in self.lab.events() if e["_method"] == 5), list(range(100)))
+            for client in clients:
+                client.close()
+            daemon.wait_for_line("was invalidated", 100)
+        self.assertEqual(len(self.lab.wait_for_events(100, _method=0, _status=1)), 100)
+        self.assertEqual(len(self.lab.storebags()), 1)
 
     def test_aggregating_client_gets_copies(self):
         with self.serving("Failed to get remote object proxy: "):  # for the copies of the session's end
