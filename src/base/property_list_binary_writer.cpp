@@ -130,19 +130,29 @@ void putBigEndian(char*& at, std::uint64_t number, std::size_t size) {
   at += size;
 }
 
-// Writes into room that is large enough. An object's number is the order in which it is begun.
+// The widths and places that follow from a measure.
+struct Layout {
+  explicit Layout(const Measure& measure) : referenceSize(widthOf(measure.objects - 1)) {
+    table = kHeader.size() + measure.bytes + measure.references * referenceSize;
+    offsetSize = widthOf(table);
+    size = table + measure.objects * offsetSize + kTrailerSize;
+  }
+  std::size_t referenceSize;
+  std::size_t offsetSize;
+  std::uint64_t table;  // where the offsets begin
+  std::uint64_t size;
+};
+
+// Writes into room of the layout's size. An object's number is the order in which it is begun.
 class Writer {
  public:
-  Writer(char* start, const Measure& measure)
-      : _start(start), _at(start), _referenceSize(widthOf(measure.objects - 1)) {
-    const std::uint64_t table = kHeader.size() + measure.bytes + measure.references * _referenceSize;
-    _offsetSize = widthOf(table);
-    _table = start + table;
-    _nextOffset = _table;
-    _size = table + measure.objects * _offsetSize + kTrailerSize;
-  }
-  // Without room: says how much it takes.
-  static std::uint64_t size(const Measure& measure) { return Writer(nullptr, measure)._size; }
+  Writer(char* start, const Layout& layout)
+      : _start(start),
+        _table(start + layout.table),
+        _referenceSize(layout.referenceSize),
+        _offsetSize(layout.offsetSize),
+        _at(start),
+        _nextOffset(_table) {}
 
   void write(const Value& value) {
     std::memcpy(_at, kHeader.data(), kHeader.size());
@@ -189,12 +199,11 @@ class Writer {
   void putDictionary(const Dictionary& dictionary);
 
   char* const _start;
-  char* _at;
+  char* const _table;
   const std::size_t _referenceSize;
-  std::size_t _offsetSize;
-  char* _table;
+  const std::size_t _offsetSize;
+  char* _at;
   char* _nextOffset;
-  std::uint64_t _size;
   std::uint64_t _next = 0;
 };
 
@@ -269,9 +278,10 @@ void Writer::putDictionary(const Dictionary& dictionary) {
 void appendBinaryPropertyList(const Value& value, std::string& out) {
   Measure measure;
   measure.add(value);
+  const Layout layout(measure);
   const std::size_t before = out.size();
-  out.resize(before + Writer::size(measure));
-  Writer(out.data() + before, measure).write(value);
+  out.resize(before + layout.size);
+  Writer(out.data() + before, layout).write(value);
 }
 
 std::string writeBinaryPropertyList(const Value& value) {
