@@ -14,9 +14,9 @@ namespace veltrad::platform {
 
 class FileStore;
 
-// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a rule with
-// more than one of the three matches when all of them match, one with none never. A missing or unreadable file grants
-// nothing; an unreadable or malformed one is one error line a change.
+// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
+// rule with more than one of the three matches when all of them match, one with none never. A missing or
+// unreadable file grants nothing; an unreadable or malformed one is one error line a change.
 class Entitlements {
  public:
   Entitlements(FileStore& files, std::string path);

@@ -21,8 +21,8 @@ class FileStore {
   virtual ~FileStore() = default;
   // A regular file of at most `most` bytes, whole.
   virtual Result<std::string, FileFailure> read(const std::string& path, std::size_t most = 16u << 20) = 0;
-  // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW, mode 0600 unless `mode` says else), syncs, renames,
-  // syncs the directory. On failure the old file is untouched and the new one gone. Nothing: done.
+  // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW, mode 0600 unless `mode` says else), syncs,
+  // renames, syncs the directory. On failure the old file is untouched and the new one gone. Nothing: done.
   virtual std::optional<FileFailure> replace(const std::string& path, std::string_view bytes,
                                              unsigned mode = 0600) = 0;
   // Renames within one directory.

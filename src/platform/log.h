@@ -2,8 +2,8 @@
 //
 //   logDebug("setSessionInfo: Configuring session %u", sessionID);
 //
-// The format is printf's, checked by the compiler, and stands in the code exactly as the user sees it. Below the
-// threshold a line costs one comparison and its arguments are not evaluated. A line is escaped as a whole
+// The format is printf's, checked by the compiler, and stands in the code exactly as the user sees it. Below
+// the threshold a line costs one comparison and its arguments are not evaluated. A line is escaped as a whole
 // (base/text.h); one line break at its end is dropped.
 #pragma once
 
@@ -31,8 +31,8 @@ void setSink(Sink sink);
 
 }  // namespace log
 
-#define VELTRA_LOG_AT(level, ...)                                                            \
-  do {                                                                                       \
+#define VELTRA_LOG_AT(level, ...)                                                                      \
+  do {                                                                                                 \
     if (::veltrad::platform::log::enabled(level)) ::veltrad::platform::log::write(level, __VA_ARGS__); \
   } while (false)
 #define logError(...) VELTRA_LOG_AT(::veltrad::platform::LogLevel::error, __VA_ARGS__)
@@ -42,9 +42,10 @@ void setSink(Sink sink);
 
 class VeltraLogging {
  public:
-  // Opens the log under the program name ("veltrad") and facility ("Daemon"): the journal when the service manager
-  // connects standard error to it, else standard error. VELTRA_LOG_TARGET=auto|stderr|syslog and
-  // VELTRA_LOG=error|warning|info|debug are read here; an unknown value is one warning line that names the choices.
+  // Opens the log under the program name ("veltrad") and facility ("Daemon"): the journal when the service
+  // manager connects standard error to it, else standard error. VELTRA_LOG_TARGET=auto|stderr|syslog and
+  // VELTRA_LOG=error|warning|info|debug are read here; an unknown value is one warning line that names the
+  // choices.
   static void startLogging(std::string_view program, std::string_view facility);
   static void stopLogging();
 };

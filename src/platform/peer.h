@@ -13,8 +13,8 @@ struct Peer {
   unsigned uid = 0;
   std::vector<unsigned> gids;  // effective first, then the supplementary ones
   int pid = 0;                 // for log lines only; 0 where the kernel does not say
-  // The system unit ("veltra-agent.service") from the control group, read while the peer's pidfd shows it alive.
-  // Absent: none, a unit of a user manager, a dead peer, or a kernel without SO_PEERPIDFD.
+  // The system unit ("veltra-agent.service") from the control group, read while the peer's pidfd shows it
+  // alive. Absent: none, a unit of a user manager, a dead peer, or a kernel without SO_PEERPIDFD.
   std::optional<std::string> unit;
 };
 

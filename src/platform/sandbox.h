@@ -1,5 +1,5 @@
-// The sandbox profile: Landlock and no-new-privileges. Main thread, before any other thread exists: the rules bind
-// the calling thread and those that it starts later.
+// The sandbox profile: Landlock and no-new-privileges. Main thread, before any other thread exists: the rules
+// bind the calling thread and those that it starts later.
 #pragma once
 
 #include <string>
@@ -20,8 +20,8 @@ struct SandboxProfile {
 // The profile "com.florn.veltrad" for this root: see docs/architecture.md.
 SandboxProfile veltradSandboxProfile(const Root& root);
 
-// Enters it. Value: one line that says what is in force. A missing path leaves its rule out, rights that the kernel
-// does not know are left out. A kernel without Landlock: `inForce` false and the line says so; with
+// Enters it. Value: one line that says what is in force. A missing path leaves its rule out, rights that the
+// kernel does not know are left out. A kernel without Landlock: `inForce` false and the line says so; with
 // VELTRA_SANDBOX=required, and when the kernel refuses, an error with the failure text.
 struct SandboxState {
   bool inForce;

@@ -18,8 +18,8 @@ class ServiceManager {
   void feedWatchdog();
   // Half of WATCHDOG_USEC; absent when no watchdog is wanted of this process.
   std::optional<std::chrono::milliseconds> watchdogInterval() const;
-  // The one listening Unix stream socket that was handed over (socket activation), made close-on-exec, or nothing.
-  // More than one, or one of another kind, is an error that says what came.
+  // The one listening Unix stream socket that was handed over (socket activation), made close-on-exec, or
+  // nothing. More than one, or one of another kind, is an error that says what came.
   Result<std::optional<int>, std::string> handedOverSocket();
 };
 
