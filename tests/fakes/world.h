@@ -1,0 +1,45 @@
+// Every service's twin in one place, and the real objects that stand on them, for tests of back ends and
+// above.
+#pragma once
+
+#include "backends/backend_factory.h"
+#include "config/process_settings.h"
+#include "fakes/fake_clock.h"
+#include "fakes/fake_device_properties.h"
+#include "fakes/fake_file_store.h"
+#include "fakes/fake_http_client.h"
+#include "fakes/fake_locale.h"
+#include "fakes/fake_preferences.h"
+#include "fakes/fake_random.h"
+#include "platform/counters.h"
+#include "platform/root.h"
+#include "protocol/veltra.h"
+#include "support/device_identity.h"
+
+namespace veltrad::inline fakes {
+
+struct World {
+  // What a test left unanswered ends well, while everything that it touches is still there.
+  ~World() {
+    for (const auto& held : http.pending()) http.answer(held, FakeHTTPClient::response(200));
+  }
+
+  FakeHTTPClient http;
+  FakeClock clock;
+  FakeRandom random;
+  FakeLocale locale;
+  FakePreferences preferences;
+  FakeDeviceProperties properties;
+  FakeFileStore files;
+  platform::Counters counters;
+  platform::Root root{"/"};
+  DeviceIdentity device{properties};
+  ProcessSettings settings{preferences, device, files, root.deploymentPath()};
+  Veltra library{files, preferences, root};
+  StandardBackendFactory factory{
+      {http, clock, random, locale, preferences, counters, settings, device, library}};
+
+  void consent() { preferences.set("DiagnosticLogSubmissionEnabled", true); }
+};
+
+}  // namespace veltrad::inline fakes
