@@ -12,7 +12,8 @@
 namespace veltrad {
 
 // What a reader spends at most on one property list; whatever the bytes say, nothing is allocated from a
-// count that the list declares before it was checked against the bytes that are there.
+// count that the list declares before it was checked against the bytes that are there. The numbers keep any
+// list under 1 MiB within 16 MiB of memory: an object takes up to 128 bytes beside its text.
 struct PropertyListLimits {
   std::size_t bytes = 64u << 20;     // length of the whole list
   int depth = 64;                    // nesting of arrays and dictionaries, the outermost being 1
@@ -41,9 +42,12 @@ Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
 Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes,
                                                       const PropertyListLimits& limits = {});
 
+// Texts that are no UTF-8 are mended, each wrong byte becoming U+FFFD.
 std::string writeBinaryPropertyList(const Value& value);
 // Appends to `out`, so that a caller can put a header in front without a copy.
 void appendBinaryPropertyList(const Value& value, std::string& out);
+// Characters that XML cannot hold become U+FFFD; dates are rounded down to whole seconds and kept within the
+// years 0 to 9999.
 std::string writeXMLPropertyList(const Value& value);
 
 }  // namespace veltrad

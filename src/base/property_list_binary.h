@@ -28,6 +28,5 @@ inline constexpr std::uint8_t kSet = 0xC0;
 inline constexpr std::uint8_t kDictionary = 0xD0;
 
 inline constexpr double kSecondsFrom1970To2001 = 978'307'200;
-inline constexpr char32_t kReplacementCharacter = 0xFFFD;
 
 }  // namespace veltrad::binary_property_list

@@ -11,6 +11,7 @@
 #include "base/property_list.h"
 #include "base/property_list_binary.h"
 #include "base/text.h"
+#include "base/utf16.h"
 
 namespace veltrad {
 
@@ -24,38 +25,6 @@ std::uint64_t bigEndian(const char* at, std::size_t size) {
   std::uint64_t number = static_cast<std::uint8_t>(at[0]);
   for (std::size_t i = 1; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
   return number;
-}
-
-char16_t unitAt(std::string_view bytes, std::size_t i) {
-  return static_cast<char16_t>(bigEndian(bytes.data() + 2 * i, 2));
-}
-
-// Calls `take` with every character of a big-endian UTF-16 text; a lone surrogate is U+FFFD.
-template <typename Take>
-void forEachCharacter(std::string_view bytes, Take take) {
-  const std::size_t units = bytes.size() / 2;
-  for (std::size_t i = 0; i < units; ++i) {
-    const char32_t unit = unitAt(bytes, i);
-    if (unit < 0xD800 || unit > 0xDFFF) {
-      take(unit);
-      continue;
-    }
-    const char32_t next = i + 1 < units ? unitAt(bytes, i + 1) : 0;
-    if (unit <= 0xDBFF && next >= 0xDC00 && next <= 0xDFFF) {
-      take(0x10000 + ((unit - 0xD800) << 10) + (next - 0xDC00));
-      ++i;
-    } else {
-      take(kReplacementCharacter);
-    }
-  }
-}
-
-std::size_t utf8Length(std::string_view utf16) {
-  std::size_t length = 0;
-  forEachCharacter(utf16, [&](char32_t code) {
-    length += code < 0x80 ? 1u : code < 0x800 ? 2u : code < 0x10000 ? 3u : 4u;
-  });
-  return length;
 }
 
 // Reads one list. On the caller's stack; the bytes outlive it.
@@ -325,10 +294,10 @@ bool Reader::readText(Object& object, std::string& text) {
     return true;
   }
   if (count > _textLeft) return chargeText(count);
-  const std::size_t length = utf8Length(bytes);
+  const std::size_t length = utf8LengthOfUTF16(bytes);
   if (!chargeText(length)) return false;
   text.reserve(length);
-  forEachCharacter(bytes, [&](char32_t code) { appendUTF8(text, code); });
+  forEachUTF16Character(bytes, [&](char32_t code) { appendUTF8(text, code); });
   return true;
 }
 

@@ -6,6 +6,7 @@
 #include "base/property_list.h"
 #include "base/property_list_binary.h"
 #include "base/text.h"
+#include "base/utf16.h"
 
 namespace veltrad {
 
@@ -33,28 +34,6 @@ std::size_t integerSize(std::uint64_t number, bool isSigned) {
   return 1 + (std::size_t{1} << exponentOf(number));
 }
 
-// Calls `take` with every UTF-16 unit of a text; bytes that are no UTF-8 are U+FFFD.
-template <typename Take>
-void forEachUnit(std::string_view text, Take take) {
-  for (std::size_t i = 0; i < text.size();) {
-    const UTF8Character character = characterAt(text, i);
-    const char32_t code = character.length == 0 ? kReplacementCharacter : character.code;
-    if (code >= 0x10000) {
-      take(static_cast<char16_t>(0xD800 + ((code - 0x10000) >> 10)));
-      take(static_cast<char16_t>(0xDC00 + ((code - 0x10000) & 0x3FF)));
-    } else {
-      take(static_cast<char16_t>(code));
-    }
-    i += character.length == 0 ? 1 : character.length;
-  }
-}
-
-std::size_t unitCount(std::string_view text) {
-  std::size_t count = 0;
-  forEachUnit(text, [&](char16_t) { ++count; });
-  return count;
-}
-
 // What a value takes: its objects, the references between them, and the bytes of all objects but references.
 struct Measure {
   std::uint64_t objects = 0;
@@ -73,7 +52,7 @@ void Measure::addText(std::string_view text) {
   if (isASCII(text)) {
     addSized(text.size(), 1);
   } else {
-    addSized(unitCount(text), 2);
+    addSized(utf16UnitCount(text), 2);
   }
 }
 
@@ -239,8 +218,8 @@ void Writer::putText(std::string_view text) {
     putHead(kASCII, text.size());
     return putBytes(text);
   }
-  putHead(kUTF16, unitCount(text));
-  forEachUnit(text, [this](char16_t unit) { putBigEndian(_at, unit, 2); });
+  putHead(kUTF16, utf16UnitCount(text));
+  forEachUTF16Unit(text, [this](char16_t unit) { putBigEndian(_at, unit, 2); });
 }
 
 void Writer::putUnsigned(std::uint64_t number) {
