@@ -23,7 +23,7 @@ using Memory = std::unique_ptr<BIO, decltype(&BIO_free)>;
 constexpr std::size_t kMostKeyFileBytes = 1u << 16;
 
 [[noreturn]] void abortFor(const char* what) {
-  std::fprintf(stderr, "veltra-storebag: OpenSSL could not %s\n", what);
+  std::fprintf(stderr, "signing key: OpenSSL could not %s\n", what);
   std::abort();
 }
 
