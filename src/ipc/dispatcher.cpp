@@ -147,13 +147,12 @@ std::string_view shortened(std::string_view text) {
 
 }  // namespace
 
-Result<Dictionary, std::string> decodeFrameBody(const Frame& frame) {
+Result<Value, std::string> decodeFrameBody(const Frame& frame) {
   const bool large = frame.header.kind == FrameKind::largeCall;
   auto parsed = parseBinaryPropertyList(frame.body, large ? kLargeCallLimits : kCallLimits);
   if (!parsed) return Failure{"the body is no readable property list: " + parsed.error().detail};
-  const Dictionary* body = parsed.value().asDictionary();
-  if (!body) return Failure{std::string("the body must be a dictionary")};
-  return *body;
+  if (!parsed.value().asDictionary()) return Failure{std::string("the body must be a dictionary")};
+  return std::move(parsed.value());
 }
 
 namespace {
@@ -166,9 +165,10 @@ Refusal runCall(const Frame& frame, ClientSessionInterface& session,
         "after its hello a client sends frames of kind 2 (call) and 6 (large call), not of kind {}",
         static_cast<unsigned>(kind));
   }
-  const auto body = decodeFrameBody(frame);
-  if (!body) return body.error();
-  const std::string* name = body.value().string("op");
+  const auto decoded = decodeFrameBody(frame);
+  if (!decoded) return decoded.error();
+  const Dictionary& body = *decoded.value().asDictionary();
+  const std::string* name = body.string("op");
   if (!name) return "\"op\" must be a text";
   const Operation* operation = operationNamed(*name);
   if (!operation) return fmt::format("unknown operation \"{}\"", shortened(*name));
@@ -176,7 +176,7 @@ Refusal runCall(const Frame& frame, ClientSessionInterface& session,
     return fmt::format("a large call is for \"{}\" alone, not for \"{}\"", kUploadLogData, *name);
   }
   static const Dictionary kNone;
-  const Dictionary* arguments = body.value().dictionary("args");
+  const Dictionary* arguments = body.dictionary("args");
   Call call{session, arguments ? *arguments : kNone, pending};
   return operation->run(call);
 }

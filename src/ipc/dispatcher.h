@@ -18,7 +18,7 @@ namespace veltrad::ipc {
 std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out);
 
-// The dictionary in a frame's body, or what is wrong with it.
-Result<Dictionary, std::string> decodeFrameBody(const Frame& frame);
+// The value in a frame's body, which is a dictionary, or what is wrong with it.
+Result<Value, std::string> decodeFrameBody(const Frame& frame);
 
 }  // namespace veltrad::ipc

@@ -87,7 +87,7 @@ bool SocketConnection::runFrames() {
   Frame frame;
   while (!_out->endRequested() && !overdue()) {
     if (_out->waitingBytes() > kOutQueueHighWater && !_stopping.load(std::memory_order_acquire)) {
-      wait();
+      waitForClientToRead();
       continue;
     }
     switch (_reader.next(frame)) {
@@ -112,7 +112,7 @@ bool SocketConnection::receive() {
     if (_reader.moreLikely()) {
       _out->flush();
     } else {
-      wait();
+      waitForBytes();
     }
     if (_out->endRequested() || overdue()) return false;
     switch (_reader.receive(_out->socket())) {
@@ -131,12 +131,18 @@ bool SocketConnection::receive() {
   }
 }
 
-// Until the client has sent something or takes something, or somebody woke us. While too much waits for the
-// client, only the latter two count.
-void SocketConnection::wait() {
-  const std::size_t waiting = _out->flush();
-  short events = waiting > 0 ? POLLOUT : 0;
-  if (waiting <= kOutQueueHighWater) events |= POLLIN;
+// Until the client has taken enough of what waits for it, or somebody woke us. Frames that have come may be
+// waiting in the reader all the while, so bytes to read are none of its business.
+void SocketConnection::waitForClientToRead() {
+  if (_out->flush() > kOutQueueHighWater) poll(POLLOUT);
+}
+
+// Until the client has sent something, or takes something that waits for it, or somebody woke us.
+void SocketConnection::waitForBytes() {
+  poll(_out->flush() > 0 ? POLLIN | POLLOUT : POLLIN);
+}
+
+void SocketConnection::poll(short events) {
   pollfd watched[] = {{_out->socket(), events, 0}, {_out->wakeUp(), POLLIN, 0}};
   if (::poll(watched, 2, -1) > 0 && watched[1].revents != 0) _out->drainWakeUp();
 }
@@ -160,7 +166,7 @@ bool SocketConnection::greet(const Frame& frame) {
   }
   const auto body = decodeFrameBody(frame);
   if (!body) return violation(fmt::format("The hello cannot be read: {}.", body.error()));
-  const Value* stated = body.value().find("wire");
+  const Value* stated = body.value().asDictionary()->find("wire");
   const auto wire = stated ? stated->toInt64() : std::nullopt;
   if (!wire) return violation("The hello cannot be read: \"wire\" must be a number.");
   if (*wire != kWireVersion) {

@@ -58,7 +58,9 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   bool runFrame(const Frame& frame);
   bool greet(const Frame& frame);
   bool receive();
-  void wait();
+  void waitForClientToRead();
+  void waitForBytes();
+  void poll(short events);
   void interrupted(const std::string& why);
   bool violation(const std::string& description);
   void end();

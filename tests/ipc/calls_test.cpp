@@ -173,6 +173,7 @@ TEST(Replies, ThatAreNeverGivenEndTheCallWithAnError) {
       return;
     }
     held.push_back(std::move(reply));
+    door.journal.add("held " + std::to_string(held.size()));
   };
   Client client = door.client();
   client.greet();
@@ -182,7 +183,7 @@ TEST(Replies, ThatAreNeverGivenEndTheCallWithAnError) {
   client.call(3, kSend, message(3, 0));
   client.call(4, kSend, message(4, 0));
   EXPECT_EQ(client.receive()->results(), "{reply=first}");
-  ASSERT_TRUE(door.journal.waitFor("sendMessage 4 0 {codec=opus}"));
+  ASSERT_TRUE(door.journal.waitFor("held 2"));
   {
     std::lock_guard lock(mutex);
     ASSERT_EQ(held.size(), 2u);
@@ -194,7 +195,6 @@ TEST(Replies, ThatAreNeverGivenEndTheCallWithAnError) {
   EXPECT_EQ(fourth->results(), "{}");
   EXPECT_EQ(client.receive()->results(), "{reply=late}");
   client.call(0, kSend, message(5, 0));
-  ASSERT_TRUE(door.journal.waitFor("sendMessage 5 0 {codec=opus}"));
   client.close();
   ASSERT_TRUE(door.journal.waitFor("end"));
   std::lock_guard lock(mutex);
