@@ -1,5 +1,6 @@
 """Real processes in a directory of their own: the lab, the daemon, its clients. Everything waits on a condition with a
 deadline; nothing sleeps for a result."""
+import atexit
 import contextlib
 import http.client
 import json
@@ -145,12 +146,18 @@ class Lab:
             shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True)
         command = [program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments]
         self.process = Process(command, None, "stdout")
-        line = json.loads(self.process.wait_for(lambda lines: lines and lines[0], "the lab's first line"))
+        try:
+            line = json.loads(self.process.wait_for(lambda lines: lines and lines[0], "the lab's first line"))
+        except AssertionError:
+            self.process.kill()
+            shutil.rmtree(self.path, ignore_errors=True)
+            raise
         self.url, self.certificate, self.public_key = line["url"], line["certificate"], line["publicKey"]
         self.port = int(self.url.rsplit(":", 1)[1])
         self.tls = ssl.create_default_context(cafile=self.certificate)
         if not Lab._keys:
             Lab._keys = pathlib.Path(tempfile.mkdtemp(prefix="veltra-keys-"))
+            atexit.register(Lab.forget_keys)
             shutil.copytree(self.path / "signing", Lab._keys / "signing")
             for name in ("certificate.pem", "certificate-key.pem"):
                 shutil.copy(self.path / name, Lab._keys)
