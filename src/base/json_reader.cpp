@@ -4,8 +4,11 @@
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
 
+#include <charconv>
+
 #include "base/base64.h"
 #include "base/json.h"
+#include "base/text.h"
 
 namespace veltrad {
 
@@ -22,18 +25,36 @@ class Handler {
     return true;  // the entry is left out
   }
   bool Bool(bool value) { return add(value); }
-  bool Int(int value) { return add(value); }
-  bool Uint(unsigned value) { return add(static_cast<std::int64_t>(value)); }
-  bool Int64(std::int64_t value) { return add(value); }
-  bool Uint64(std::uint64_t value) { return add(value); }
-  bool Double(double value) { return add(value); }
-  bool RawNumber(const char*, rapidjson::SizeType, bool) { return fail("a number as a text"); }
-  bool String(const char* text, rapidjson::SizeType length, bool) { return add(std::string(text, length)); }
+  // Numbers come as texts (the other number events never): RapidJSON's own conversion stumbles over 0e300.
+  bool Int(int) { return false; }
+  bool Uint(unsigned) { return false; }
+  bool Int64(std::int64_t) { return false; }
+  bool Uint64(std::uint64_t) { return false; }
+  bool Double(double) { return false; }
+  bool RawNumber(const char* text, rapidjson::SizeType length, bool) {
+    const char* end = text + length;
+    std::int64_t asSigned = 0;
+    if (const auto [stop, error] = std::from_chars(text, end, asSigned);
+        error == std::errc() && stop == end) {
+      return add(asSigned);
+    }
+    std::uint64_t asUnsigned = 0;
+    if (const auto [stop, error] = std::from_chars(text, end, asUnsigned);
+        error == std::errc() && stop == end) {
+      return add(asUnsigned);
+    }
+    double real = 0;
+    if (std::from_chars(text, end, real).ec != std::errc()) return fail("a number beyond the range of reals");
+    return add(real);
+  }
+  bool String(const char* text, rapidjson::SizeType length, bool) {
+    return isText({text, length}) && add(std::string(text, length));
+  }
 
   bool StartObject() { return open(true); }
   bool Key(const char* text, rapidjson::SizeType length, bool) {
     _open.back().key.assign(text, length);
-    return true;
+    return isText({text, length});
   }
   bool EndObject(rapidjson::SizeType) {
     auto entries = std::move(_open.back().entries);
@@ -68,6 +89,8 @@ class Handler {
     std::string key;
   };
 
+  // RapidJSON lets the second half of a surrogate pair pass without its first.
+  bool isText(std::string_view text) { return isUTF8(text) || fail("half of a surrogate pair"); }
   bool fail(std::string what) {
     _failure = std::move(what);
     return false;
@@ -98,7 +121,7 @@ class Handler {
 
 Result<Value, JSONError> parseJSON(std::string_view text) {
   constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag |
-                              rapidjson::kParseFullPrecisionFlag;
+                              rapidjson::kParseNumbersAsStringsFlag;
   Handler handler;
   rapidjson::Reader reader;
   rapidjson::MemoryStream stream(text.data(), text.size());

@@ -18,6 +18,7 @@ TEST(JSON, readsValues) {
       {"18446744073709551616", 18446744073709551616.0},
       {"1.0", 1.0},
       {"1e2", 100.0},
+      {"[0e300, -0.0, -1.5E-3]", Array{0.0, -0.0, -0.0015}},
       {R"("\u00e9\ud83d\ude00\u0000")", "\u00e9\U0001F600\0"s},
       {R"([{}, [], {"a": 1, "n": null, "a": 2}])", Array{Dictionary{}, Array{}, Dictionary{{"a", 2}}}},
       {R"({"$date": 1.5})", Date{1.5}},
@@ -57,6 +58,7 @@ TEST(JSON, saysWhatIsWrongAndWhere) {
                       {"\"\\ud800\"", 1},
                       {"[1,]", 3},
                       {std::string(100'000, '['), 65},
+                      {"\"\\ude00\"", 8},
                       {R"({"$date": "x"})", 14},
                       {R"({"$data": "*A"})", 15}};
   for (const Case& c : kCases) {
