@@ -1,4 +1,5 @@
-// What the daemon exports to each connection. The connection's own thread calls it, one call at a time, in order.
+// What the daemon exports to each connection. The connection's own thread calls it, one call at a time, in
+// order.
 #pragma once
 
 #include <cstdint>
@@ -12,8 +13,8 @@
 
 namespace veltrad {
 
-// Called at most once, from any thread. When the last copy goes without a call, the client's call ends with the
-// error "The daemon gave no reply.". Empty where the client wants no reply.
+// Called at most once, from any thread. When the last copy goes without a call, the client's call ends with
+// the error "The daemon gave no reply.". Empty where the client wants no reply.
 template <typename... Results>
 using Reply = std::function<void(Results...)>;
 
@@ -39,15 +40,17 @@ class ClientSessionInterface {
   virtual void sendMessageWithDictionary(Dictionary message, StringReply reply) = 0;
   virtual void flushMessagesWithCompletion(FlushReply completion) = 0;
   virtual void finishSessionWithReply(StringReply reply) = 0;
-  // `path` is the path of the client's file address. `extensionToken` names what the client lent; empty: nothing.
-  virtual void uploadFileAtPath(std::string path, std::string extensionToken, BooleanReply completionHandler) = 0;
+  // `path` is the path of the client's file address. `extensionToken` names what the client lent; empty:
+  // nothing.
+  virtual void uploadFileAtPath(std::string path, std::string extensionToken,
+                                BooleanReply completionHandler) = 0;
   virtual void uploadLogData(Array logData, UploadLogDataReply completionHandler) = 0;
   virtual void sendMessageWithSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
-                                          std::uint16_t category, std::uint16_t type, OptionalDictionary payload,
-                                          StringReply reply) = 0;
+                                          std::uint16_t category, std::uint16_t type,
+                                          OptionalDictionary payload, StringReply reply) = 0;
 
-  // After the connection was invalidated and its handler has run, on the connection's own thread; once, the last
-  // call of all.
+  // After the connection was invalidated and its handler has run, on the connection's own thread; once, the
+  // last call of all.
   virtual void end() = 0;
   // For log lines; stable and unique among live objects.
   virtual std::string description() const = 0;

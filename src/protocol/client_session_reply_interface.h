@@ -11,9 +11,11 @@ namespace veltrad {
 class ClientSessionReplyInterface {
  public:
   virtual ~ClientSessionReplyInterface() = default;
-  // No answer is awaited. `timestamp` in seconds since 1970. Everything empty or zero: the end of aggregation.
-  virtual void sendMessageToClient(std::optional<Dictionary> sessionInfo, double timestamp, std::uint16_t category,
-                                   std::uint16_t type, std::optional<Dictionary> payload) = 0;
+  // No answer is awaited. `timestamp` in seconds since 1970. Everything empty or zero: the end of
+  // aggregation.
+  virtual void sendMessageToClient(std::optional<Dictionary> sessionInfo, double timestamp,
+                                   std::uint16_t category, std::uint16_t type,
+                                   std::optional<Dictionary> payload) = 0;
 };
 
 }  // namespace veltrad

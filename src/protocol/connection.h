@@ -13,8 +13,9 @@
 
 namespace veltrad {
 
-// Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's own
-// thread reads frames and runs calls and handlers, one at a time. remoteObjectProxyWithErrorHandler: any thread.
+// Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's
+// own thread reads frames and runs calls and handlers, one at a time. remoteObjectProxyWithErrorHandler: any
+// thread.
 class Connection {
  public:
   virtual ~Connection() = default;
@@ -28,8 +29,8 @@ class Connection {
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   virtual void resume() = 0;
 
-  // The client's object. A call on it never blocks; when it fails (the client has gone, or its queue is full) the
-  // handler gets the error's description, on the calling thread, inside that call.
+  // The client's object. A call on it never blocks; when it fails (the client has gone, or its queue is full)
+  // the handler gets the error's description, on the calling thread, inside that call.
   virtual std::shared_ptr<ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
       std::function<void(const std::string&)> handler) = 0;
 };
@@ -39,8 +40,8 @@ class Listener;
 class ListenerDelegate {
  public:
   virtual ~ListenerDelegate() = default;
-  // True: accepted and resumed. False: refused, and nothing was kept. Runs on the listener's thread, or on the new
-  // connection's own.
+  // True: accepted and resumed. False: refused, and nothing was kept. Runs on the listener's thread, or on
+  // the new connection's own.
   virtual bool listener(Listener& listener, const std::shared_ptr<Connection>& shouldAcceptNewConnection) = 0;
 };
 

@@ -29,9 +29,10 @@ inline constexpr const char* kVeltraUserInfoClientName = "clientName";    // tex
 inline constexpr const char* kVeltraUserInfoServiceName = "serviceName";  // text
 
 // Message dictionary.
-inline constexpr const char* kVeltraMessageParametersCategory = "category";  // unsigned 32-bit, low 16 bits used
-inline constexpr const char* kVeltraMessageParametersType = "type";          // unsigned 32-bit, low 16 bits used
-inline constexpr const char* kVeltraMessageParametersPayload = "payload";    // dictionary
-inline constexpr const char* kVeltraMessageParametersFlag = "flag";          // unsigned 32-bit
+inline constexpr const char* kVeltraMessageParametersCategory =
+    "category";                                                      // unsigned 32-bit, low 16 bits used
+inline constexpr const char* kVeltraMessageParametersType = "type";  // unsigned 32-bit, low 16 bits used
+inline constexpr const char* kVeltraMessageParametersPayload = "payload";  // dictionary
+inline constexpr const char* kVeltraMessageParametersFlag = "flag";        // unsigned 32-bit
 
 }  // namespace veltrad

@@ -9,9 +9,9 @@
 namespace veltrad {
 
 struct ReportingError {
-  std::string domain;        // kVeltraErrorDomain
-  std::int64_t code = -1;    // -1 for local failures, else the HTTP status of a server's refusal
-  std::string description;   // the message text
+  std::string domain;       // kVeltraErrorDomain
+  std::int64_t code = -1;   // -1 for local failures, else the HTTP status of a server's refusal
+  std::string description;  // the message text
   bool operator==(const ReportingError&) const = default;
 };
 

@@ -1,5 +1,5 @@
-// Facts of the client library that the daemon shares: its package version, its public key, its identifiers. Any
-// thread.
+// Facts of the client library that the daemon shares: its package version, its public key, its identifiers.
+// Any thread.
 #pragma once
 
 #include <optional>
@@ -21,8 +21,9 @@ class Veltra {
   std::string packageVersion() const;
   // The bytes of the resource "publicKey" of type "der"; read afresh at each call.
   std::optional<std::string> publicKeyDER() const;
-  // A 36-character UUID text that stays the same across restarts: one while consent is respected (true), another
-  // while it is overridden (false). Made and stored on first use under "uuidRespectDNU" and "uuidOverrideDNU".
+  // A 36-character UUID text that stays the same across restarts: one while consent is respected (true),
+  // another while it is overridden (false). Made and stored on first use under "uuidRespectDNU" and
+  // "uuidOverrideDNU".
   std::string getPersistentIdentifierForDNU(bool respectDNU) const;
 
  private:

@@ -62,8 +62,15 @@ struct Source final : StorebagSource {
 
 class Agent : public ::testing::Test {
  protected:
+  // A connection and its session hold each other until the end.
+  void TearDown() override {
+    for (const auto& connection : connections) {
+      if (connection->session) connection->invalidate();
+    }
+    EXPECT_EQ(agent.sessionCount(), 0u);
+  }
   std::shared_ptr<FakeConnection> connect() {
-    auto connection = std::make_shared<FakeConnection>();
+    auto connection = connections.emplace_back(std::make_shared<FakeConnection>());
     EXPECT_TRUE(agent.listener(door, connection));
     return connection;
   }
@@ -87,6 +94,7 @@ class Agent : public ::testing::Test {
   FlushCounters flushes;
   Silent messageLog;
   Source source;
+  std::vector<std::shared_ptr<FakeConnection>> connections;
   FakeTransaction transaction;
   // The agent never looks at it, so there is none behind the reference.
   alignas(16) char nobody[16] = {};
