@@ -24,7 +24,7 @@ inline constexpr PropertyListLimits kStorebagContainerLimits{.bytes = kStorebagM
 // same.
 inline constexpr PropertyListLimits kStorebagBagLimits{.bytes = kStorebagMostContainerBytes,
                                                        .depth = 32,
-                                                       .objects = 20'000,
+                                                       .objects = 65'536,
                                                        .textBytes = kStorebagMostContainerBytes};
 
 // The texts of the container; one that is missing or no text is absent.
