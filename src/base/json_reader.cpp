@@ -57,10 +57,11 @@ class Handler {
     return isText({text, length});
   }
   bool EndObject(rapidjson::SizeType) {
-    auto entries = std::move(_open.back().entries);
+    // Repeated keys are one before the meaning is looked for.
+    Dictionary dictionary = Dictionary::fromEntries(std::move(_open.back().entries));
     _open.pop_back();
-    if (entries.size() != 1) return add(Dictionary::fromEntries(std::move(entries)));
-    const auto& [key, value] = entries.front();
+    if (dictionary.size() != 1) return add(std::move(dictionary));
+    const auto& [key, value] = *dictionary.begin();
     if (key == "$date") {
       const auto seconds = value.isNumber() ? value.toDouble() : std::nullopt;
       return seconds ? add(Date{*seconds}) : fail("\"$date\" holds no number");
@@ -69,7 +70,7 @@ class Handler {
       auto bytes = value.asString() ? decodeBase64(*value.asString()) : std::nullopt;
       return bytes ? add(Data{std::move(*bytes)}) : fail("\"$data\" holds no base64");
     }
-    return add(Dictionary::fromEntries(std::move(entries)));
+    return add(std::move(dictionary));
   }
   bool StartArray() { return open(false); }
   bool EndArray(rapidjson::SizeType) {

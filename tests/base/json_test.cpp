@@ -22,6 +22,7 @@ TEST(JSON, readsValues) {
       {R"("\u00e9\ud83d\ude00\u0000")", "\u00e9\U0001F600\0"s},
       {R"([{}, [], {"a": 1, "n": null, "a": 2}])", Array{Dictionary{}, Array{}, Dictionary{{"a", 2}}}},
       {R"({"$date": 1.5})", Date{1.5}},
+      {R"({"$date": 1, "$date": 2})", Date{2}},
       {R"({"$data": "AAE="})", Data{"\0\1"s}},
       {R"({"$date": 1, "b": 2})", Dictionary{{"$date", 1}, {"b", 2}}},
       {std::string(64, '[') + std::string(64, ']'),
