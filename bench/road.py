@@ -1,0 +1,68 @@
+"""First measures of the whole road, with the programs of VELTRA_BUILD (build/release by default): one client's sends
+beside a bare socket ping-pong, the daemon's CPU a message, its memory, its time to accepting. Ratios hold; single
+figures depend on the machine. With VELTRA_PIN=1 all of it runs on one core."""
+import json
+import os
+import pathlib
+import subprocess
+import sys
+import time
+
+SOURCE = pathlib.Path(__file__).resolve().parent.parent
+os.environ.setdefault("VELTRA_BUILD", str(SOURCE / "build" / "release"))
+sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
+from harness import Daemon, Lab, Root, program, wait_until  # noqa: E402
+
+SESSIONS = 100
+
+
+def memory_kib(pid):
+    status = pathlib.Path(f"/proc/{pid}/status").read_text()
+    return int(next(line.split()[1] for line in status.splitlines() if line.startswith("VmRSS")))
+
+
+def cpu_seconds(pid):
+    fields = pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()
+    return (int(fields[11]) + int(fields[12])) / os.sysconf("SC_CLK_TCK")
+
+
+def start_milliseconds(root):
+    """From exec to the ready notification's line, and to a connection that is accepted."""
+    begin = time.monotonic()
+    daemon = Daemon(root, env={"VELTRA_LOG": "info"})
+    ready = (time.monotonic() - begin) * 1000
+    return daemon, ready
+
+
+def main():
+    if os.environ.get("VELTRA_PIN"):
+        os.sched_setaffinity(0, {0})
+    root, lab = Root(), Lab()
+    try:
+        root.use(lab)
+        entry = {"post_url": lab.url + "/collect/events", "filters": [], "event_threshold": 1000}
+        lab.put("ostvane", {"release": {"httppost": {"clients": [entry]}}, "version": "1"})
+        daemon, ready = start_milliseconds(root)
+        figures = {"startToAcceptingMs": round(ready, 1), "restKiB": memory_kib(daemon.popen.pid)}
+        before = cpu_seconds(daemon.popen.pid)
+        done = subprocess.run([program("send_bench"), str(root.path)], capture_output=True, text=True, check=True)
+        figures.update(json.loads(done.stdout))
+        messages = figures["roundTrips"] + figures["oneWay"]
+        figures["daemonMicrosecondsAMessage"] = round((cpu_seconds(daemon.popen.pid) - before) / messages * 1e6, 2)
+        figures["afterPostsKiB"] = memory_kib(daemon.popen.pid)
+        clients = [subprocess.Popen([program("veltractl"), "--root", str(root.path), "session", "--client-type", "6"],
+                                    stdin=subprocess.PIPE, stdout=subprocess.PIPE) for _ in range(SESSIONS)]
+        for client in clients:
+            client.stdout.readline()
+        figures["kibASession"] = round((memory_kib(daemon.popen.pid) - figures["afterPostsKiB"]) / SESSIONS, 1)
+        for client in clients:
+            client.communicate()
+        daemon.stop()
+        print(json.dumps(figures, indent=2))
+    finally:
+        lab.stop()
+        Lab.forget_keys()
+        root.remove()
+
+
+main()

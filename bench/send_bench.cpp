@@ -1,0 +1,136 @@
+// One client's sends beside a bare socket ping-pong of the same bytes, in one run, interleaved. Prints JSON.
+// Usage: send_bench ROOT (the daemon of that root serves client type 6 with a batching back end)
+#include <fmt/format.h>
+#include <sched.h>
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <veltra/veltra.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+constexpr int kRounds = 300;
+constexpr int kCallsARound = 100;
+constexpr int kOneWay = 100'000;
+// The frames of such a call and of its answer without a text, header included.
+constexpr std::size_t kCallBytes = 395;
+constexpr std::size_t kReplyBytes = 66;
+
+[[noreturn]] void fail(const std::string& text) {
+  std::fprintf(stderr, "send_bench: %s\n", text.c_str());
+  std::exit(1);
+}
+
+void throwBack(int socket) {
+  std::vector<char> buffer(kCallBytes);
+  for (;;) {
+    std::size_t have = 0;
+    while (have < kCallBytes) {
+      const ssize_t got = read(socket, buffer.data(), kCallBytes - have);
+      if (got <= 0) _exit(0);
+      have += static_cast<std::size_t>(got);
+    }
+    if (write(socket, buffer.data(), kReplyBytes) < 0) _exit(0);
+  }
+}
+
+void bareTrip(int socket) {
+  static std::vector<char> buffer(kCallBytes, 'x');
+  if (write(socket, buffer.data(), kCallBytes) < 0) fail("the bare socket broke");
+  std::size_t have = 0;
+  while (have < kReplyBytes) {
+    const ssize_t got = read(socket, buffer.data(), kReplyBytes - have);
+    if (got <= 0) fail("the bare socket broke");
+    have += static_cast<std::size_t>(got);
+  }
+}
+
+veltra_value* payload() {
+  veltra_value* made = veltra_dictionary();
+  for (int i = 0; i < 8; ++i) {
+    const std::string key = fmt::format("field{}", i);
+    veltra_dictionary_set(made, key.c_str(), veltra_string(fmt::format("value number {}", i).c_str()));
+  }
+  veltra_dictionary_set(made, "seconds", veltra_real(12.5));
+  veltra_dictionary_set(made, "count", veltra_signed(42));
+  return made;
+}
+
+double nanosecondsOf(const std::function<void()>& trip) {
+  const auto begin = Clock::now();
+  for (int i = 0; i < kCallsARound; ++i) trip();
+  return std::chrono::duration<double, std::nano>(Clock::now() - begin).count() / kCallsARound;
+}
+
+double median(std::vector<double> numbers) {
+  std::sort(numbers.begin(), numbers.end());
+  return numbers[numbers.size() / 2];
+}
+
+}  // namespace
+
+int main(int count, char** arguments) {
+  if (count != 2) fail("usage: send_bench ROOT");
+  int pair[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM, 0, pair) != 0) fail("no socket pair");
+  const pid_t child = fork();
+  if (child == 0) {
+    close(pair[0]);
+    throwBack(pair[1]);
+  }
+  close(pair[1]);
+
+  veltra_session_options options;
+  veltra_session_options_init(&options);
+  options.root = arguments[1];
+  options.has_client_type = true;
+  options.client_type = 6;
+  options.batch_events = true;
+  char* error = nullptr;
+  veltra_session* session = veltra_session_create(&options, nullptr, &error);
+  if (!session) fail(error);
+  veltra_reply* started = nullptr;
+  if (veltra_session_start_wait(session, &started) != VELTRA_OK || !veltra_reply_backends(started)) {
+    fail("no back ends: is the root's daemon configured for client type 6?");
+  }
+  veltra_value* message = payload();
+  const auto sendTrip = [&] {
+    if (veltra_session_send_wait(session, 5, 2, message, 0, nullptr) != VELTRA_OK) fail("a send failed");
+  };
+  std::vector<double> bare, sent, ratios;
+  for (int round = 0; round < kRounds; ++round) {
+    bare.push_back(nanosecondsOf([&] { bareTrip(pair[0]); }));
+    sent.push_back(nanosecondsOf(sendTrip));
+    ratios.push_back(sent.back() / bare.back());
+  }
+  const auto begin = Clock::now();
+  int dropped = 0;
+  for (int i = 0; i < kOneWay; ++i) {
+    while (veltra_session_send(session, 5, 2, message, 0, nullptr, nullptr) == VELTRA_QUEUE_FULL) {
+      ++dropped;
+      sched_yield();
+    }
+  }
+  sendTrip();  // answered after all of them
+  const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
+  fmt::print(
+      "{{\"bareNs\": {:.0f}, \"sendNs\": {:.0f}, \"ratio\": {:.2f}, \"oneWayPerSecond\": {:.0f}, "
+      "\"roundTrips\": {}, \"oneWay\": {}, \"queueFull\": {}}}\n",
+      median(bare), median(sent), median(ratios), kOneWay / seconds, kRounds * kCallsARound, kOneWay,
+      dropped);
+  veltra_release(message);
+  veltra_reply_release(started);
+  veltra_session_close(session);
+  close(pair[0]);
+  waitpid(child, nullptr, 0);
+  return 0;
+}
