@@ -84,6 +84,7 @@ std::size_t stop(platform::Services& services, Listener& listener) {
 
 int main() {
   platform::takeUtilitySchedulingClass();
+  platform::shareHeaps();
   platform::VeltraLogging::startLogging("veltrad", "Daemon");
   platform::raiseDescriptorLimit();
   platform::RunLoop loop;

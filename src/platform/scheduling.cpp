@@ -2,6 +2,7 @@
 // reported.
 #include "platform/scheduling.h"
 
+#include <malloc.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -22,6 +23,10 @@ void takeUtilitySchedulingClass() {
   const int now = getpriority(PRIO_PROCESS, 0);
   if (errno == 0 && now < kUtilityNice) setpriority(PRIO_PROCESS, 0, kUtilityNice);
   syscall(SYS_ioprio_set, kIOPriorityWhoProcess, 0, kIOPriorityBestEffort | kUtilityIOLevel);
+}
+
+void shareHeaps() {
+  mallopt(M_ARENA_MAX, 2);
 }
 
 void raiseDescriptorLimit() {

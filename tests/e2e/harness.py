@@ -224,7 +224,7 @@ class Daemon(Process):
     def __init__(self, root, wrapper=(), serving=True, env={}, **options):
         self.root, self.allowed = root, list(self.machine)
         super().__init__([*wrapper, program("veltrad")],
-                         root.environment(VELTRA_LOG="debug", VELTRA_LOG_TARGET="stderr", **env), **options)
+                         root.environment(**{"VELTRA_LOG": "debug", "VELTRA_LOG_TARGET": "stderr", **env}), **options)
         if serving:
             self.wait_for_line(SERVING)
 
