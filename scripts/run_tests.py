@@ -44,6 +44,8 @@ def run(command, environment):
         failed = int(match[1])
     if match := re.findall(r"^(\d+) passed, (\d+) failed", output, re.M):
         passed, failed = int(match[-1][0]), int(match[-1][1])
+    if match := re.search(r"^(\d+) inputs replayed$", output, re.M):
+        passed = int(match[1])
     if status != 0 and failed == 0:
         failed = 1  # crashed, timed out, or a sanitizer's report
     if status == 0 and passed == 0:
@@ -56,7 +58,7 @@ def programs(preset):
     for program in sorted(binaries.glob("test_*")):
         yield [str(program), "--gtest_brief=1"]
     for program in sorted(binaries.glob("replay_*")):
-        yield [str(program)]
+        yield [str(program), "tests/fuzz/corpus/" + program.name.removeprefix("replay_")]
     if preset == "dev":
         yield [sys.executable, "tests/must_not_compile/run.py"]
     yield [sys.executable, "tests/e2e/run.py"]
@@ -70,7 +72,8 @@ def test(preset):
         passed, failed, output = run(command, environment)
         total[0] += passed
         total[1] += failed
-        name = " ".join(Path(part).name if os.sep in part else part for part in command if not part.startswith("--"))
+        last = Path(command[-1]) if command[0] == sys.executable else Path(command[0])
+        name = last.parent.name if last.name == "run.py" else last.name
         say(f"{preset}: {name}: {passed} passed, {failed} failed ({time.monotonic() - started:.1f} s)")
         if failed:
             print(output, flush=True)
