@@ -4,7 +4,7 @@ import plistlib
 import subprocess
 import time
 
-from harness import SOURCE, SystemTest, Wire, program, wait_until
+from harness import IDENTITY, SOURCE, SystemTest, Wire, program, wait_until
 
 
 class Road(SystemTest):
@@ -164,6 +164,21 @@ class Ctl(SystemTest):
             "domain": "com.florn.veltra.error", "code": -1, "description": "Nothing to flush"}})
         for answer in (start, restart, states):
             self.assertEqual(answer["backends"], ["httppost"])
+
+    def test_copies_between_answers(self):
+        lines = [json.dumps({"op": "send", "category": 5, "type": 2, "payload": {"number": n, "text": "a\nb"}})
+                 for n in range(100)]
+        with self.serving("Failed to get remote object proxy: "):  # for the copies of the session's end
+            out, _ = self.ctl("session", "--client-type", "7", "--session-id", "9", *IDENTITY, "--aggregate",
+                              input="\n".join(lines) + '\n{"op":"finish"}\n')
+        printed = [json.loads(line) for line in out.splitlines()]
+        self.assertEqual([line["op"] for line in printed[:2]], ["aggregated", "start"])
+        self.assertEqual([line["op"] for line in printed[2:-2]], ["aggregated", "send"] * 100)
+        for number, copy in enumerate(printed[2:-2:2]):
+            self.assertEqual(copy["payload"], {"number": number, "text": "a\nb", "clientName": "phone",
+                                               "serviceName": "ringer"})
+            self.assertEqual((copy["category"], copy["type"], copy["sessionInfo"]["sessionID"]), (5, 2, 9))
+        self.assertEqual((printed[-2]["category"], printed[-2]["type"], printed[-2]["payload"]), (0, 2, None))
 
     def test_single_calls(self):
         with self.serving() as daemon:

@@ -61,6 +61,15 @@ TEST(Answers, nameTheMalformedLine) {
             R"({"op":"error","line":12,"description":"unknown op \"x\""})");
 }
 
+TEST(Answers, aCopyStandsInOneLineWithNullForNothing) {
+  EXPECT_EQ(formatAggregated({Dictionary{{"sessionID", 42u}}, 1416171234.25, 5, 65535,
+                              Dictionary{{"at", Date{7}}, {"text", "a\nb"}}}),
+            R"({"op":"aggregated","sessionInfo":{"sessionID":42},"timestamp":1416171234.25,"category":5,)"
+            R"("type":65535,"payload":{"at":{"$date":7.0},"text":"a\nb"}})");
+  EXPECT_EQ(formatAggregated({}),
+            R"({"op":"aggregated","sessionInfo":null,"timestamp":0.0,"category":0,"type":0,"payload":null})");
+}
+
 TEST(Answers, aCallThatNeverLeftSaysWhy) {
   const Answer answer = answerOfFailure(VELTRA_QUEUE_FULL);
   EXPECT_EQ(answer.status, VELTRA_QUEUE_FULL);

@@ -1,4 +1,5 @@
-// What a call was answered, and the one line that says so. Plain values and pure functions; any thread.
+// What a call was answered, what came beside answers, and the one line that says so. Plain values and pure
+// functions; any thread.
 #include "tools/ctl/answers.h"
 
 #include <fmt/format.h>
@@ -61,6 +62,15 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
   if (operation == Operation::flush || answer.status != VELTRA_OK)
     text += ",\"error\":" + formatError(answer.error);
   return text + '}';
+}
+
+std::string formatAggregated(const AggregatedCopy& copy) {
+  const auto orNull = [](const std::optional<Dictionary>& dictionary) {
+    return dictionary ? writeJSON(*dictionary) : std::string("null");
+  };
+  return fmt::format(
+      R"({{"op":"aggregated","sessionInfo":{},"timestamp":{},"category":{},"type":{},"payload":{}}})",
+      orNull(copy.sessionInfo), writeJSON(copy.timestamp), copy.category, copy.type, orNull(copy.payload));
 }
 
 std::string formatMalformedLine(std::uint64_t line, std::string_view description) {

@@ -37,8 +37,10 @@ Answer answerOf(const veltra_reply* reply) {
 
 }  // namespace
 
-ClientSession::ClientSession(Interrupt& interrupt)
-    : _interrupt(interrupt), _arrived(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
+ClientSession::ClientSession(Interrupt& interrupt, CopyHandler aggregated)
+    : _interrupt(interrupt),
+      _aggregated(std::move(aggregated)),
+      _arrived(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
 
 ClientSession::~ClientSession() {
   close();
@@ -60,6 +62,8 @@ std::optional<std::string> ClientSession::open(const std::optional<std::string>&
   options.require_user_info = identity.requireUserInfo;
   options.batch_events = identity.batchEvents;
   options.user_info = userInfo.get();
+  options.aggregated = _aggregated ? &ClientSession::aggregated : nullptr;
+  options.aggregated_context = this;
 
   veltra_status status = VELTRA_OK;
   char* error = nullptr;
@@ -142,6 +146,12 @@ void ClientSession::answered(void* context, const veltra_reply* reply) {
     self._answer = std::move(answer);
   }
   eventfd_write(self._arrived.get(), 1);
+}
+
+void ClientSession::aggregated(void* context, const veltra_value* sessionInfo, double timestamp,
+                               std::uint16_t category, std::uint16_t type, const veltra_value* payload) {
+  const auto& self = *static_cast<const ClientSession*>(context);
+  self._aggregated({dictionaryOf(sessionInfo), timestamp, category, type, dictionaryOf(payload)});
 }
 
 }  // namespace veltrad::ctl

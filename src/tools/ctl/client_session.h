@@ -15,11 +15,13 @@
 
 namespace veltrad::ctl {
 
-// One call at a time, each waited for. A call that gives nothing was interrupted: then only close() makes
-// sense. The interrupt must outlive it.
+// One call at a time, each waited for; copies come on the library's thread, in order among the answers. A
+// call that gives nothing was interrupted: then only close() makes sense. The interrupt must outlive it.
 class ClientSession {
  public:
-  explicit ClientSession(Interrupt& interrupt);
+  using CopyHandler = std::function<void(const AggregatedCopy&)>;
+  // With a handler the session aggregates.
+  explicit ClientSession(Interrupt& interrupt, CopyHandler aggregated = nullptr);
   ~ClientSession();
   ClientSession(const ClientSession&) = delete;
   ClientSession& operator=(const ClientSession&) = delete;
@@ -43,11 +45,14 @@ class ClientSession {
  private:
   using Call = std::function<veltra_status(veltra_callback, void*)>;
   std::optional<Answer> await(const Call& call);
-  // On the library's thread.
+  // Both on the library's thread.
   static void answered(void* context, const veltra_reply* reply);
+  static void aggregated(void* context, const veltra_value* sessionInfo, double timestamp,
+                         std::uint16_t category, std::uint16_t type, const veltra_value* payload);
 
   // Constant after construction.
   Interrupt& _interrupt;
+  const CopyHandler _aggregated;
   const platform::FileDescriptor _arrived;  // an event descriptor
   // Own thread only.
   veltra_session* _session = nullptr;

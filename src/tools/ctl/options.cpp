@@ -97,6 +97,9 @@ constexpr const char* kSessionFooter = R"(One JSON object a line, answered by on
   {"op":"finish"}             the end of the input closes without it
 {"$date": seconds since 1970} is a date, {"$data": "base64"} is data.
 
+With --aggregate the copies stand between the answers, one a line, null where there is nothing:
+  {"op":"aggregated","sessionInfo":{…},"timestamp":…,"category":5,"type":1,"payload":{…}}
+
 Example:
   echo '{"op":"flush"}' | veltractl session --client-type 7 --client phone --service ringer)";
 
@@ -122,6 +125,7 @@ CLI::App* addCommand(CLI::App& app, Options& options, Command command, const std
 void addSession(CLI::App& app, Options& options, Texts& texts) {
   CLI::App* session =
       addCommand(app, options, Command::session, "session", "Start a session and run one operation a line");
+  session->add_flag("--aggregate", options.aggregate, "Print copies of the session's messages, too");
   session->add_option("--input", options.input, "Read the lines from FILE instead of standard input")
       ->type_name("FILE");
   addIdentity(*session, options.identity, texts, false);

@@ -28,6 +28,7 @@ struct Options {
   std::optional<std::string> root;  // absent: VELTRA_ROOT, else "/"
   bool json = false;
   Identity identity;                 // all but stats
+  bool aggregate = false;            // session
   std::optional<std::string> input;  // session: a file; absent: standard input
   std::uint16_t category = 0;        // send, as are those that follow
   std::uint16_t type = 0;

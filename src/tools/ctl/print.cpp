@@ -1,4 +1,5 @@
-// What veltractl writes: results on standard output, everything else on standard error. Own thread only.
+// What veltractl writes: results on standard output, everything else on standard error. Any
+// thread.
 #include "tools/ctl/print.h"
 
 #include <fmt/format.h>
@@ -6,12 +7,13 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <string>
 
 namespace veltrad::ctl {
 
 bool printLine(std::string_view line) {
-  std::fwrite(line.data(), 1, line.size(), stdout);
-  std::fputc('\n', stdout);
+  const std::string whole = std::string(line) + '\n';  // one call, which takes the stream's lock once
+  std::fwrite(whole.data(), 1, whole.size(), stdout);
   if (std::fflush(stdout) == 0 && !std::ferror(stdout)) return true;
   complain(fmt::format("Cannot write to standard output: {}.", std::strerror(errno)));
   return false;

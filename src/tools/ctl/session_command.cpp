@@ -122,7 +122,11 @@ int runSession(const Options& options, Interrupt& interrupt) {
       return 2;
     }
   }
-  ClientSession session(interrupt);
+  // A copy that cannot be written has been complained about; the next answer then ends the session.
+  const auto printCopy = [](const AggregatedCopy& copy) {
+    static_cast<void>(printLine(formatAggregated(copy)));
+  };
+  ClientSession session(interrupt, options.aggregate ? ClientSession::CopyHandler(printCopy) : nullptr);
   if (const auto problem = session.open(options.root, options.identity)) {
     complain(*problem);
     return 1;

@@ -1,4 +1,4 @@
-// From the system's values to those of the C interface. Pure; any thread.
+// Between the system's values and those of the C interface. Pure; any thread.
 #pragma once
 
 #include <memory>
@@ -18,5 +18,7 @@ using VeltraValue = std::unique_ptr<veltra_value, VeltraValueRelease>;
 VeltraValue toVeltraValue(const Value& value);
 // Null for nothing.
 VeltraValue toVeltraValue(const std::optional<Dictionary>& dictionary);
+// Nothing for NULL and for anything else than a dictionary.
+std::optional<Dictionary> dictionaryOf(const veltra_value* value);
 
 }  // namespace veltrad::ctl
