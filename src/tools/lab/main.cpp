@@ -25,8 +25,9 @@ constexpr const char* kAbout =
     "  POST   /control                misbehave as the JSON object in the body says; DELETE: behave again\n"
     "  GET    /received?kind=events   what arrived (or kind=storebags), one JSON object a line\n"
     "  GET    /                       a page with the newest arrivals\n\n"
-    "Misbehaviour: path (a prefix), times, status, delayMs, cut, cutHalfway, stall, endless,\n"
-    "sign (wrong, missing, none), lastModified, headers, body.";
+    "Misbehaviour: path (a prefix), times, status, delayMs, dripMs (between the bytes of the body), cut,\n"
+    "cutHalfway, stall, endless, sign (wrong, missing, none), lastModified, headers, body. A redirect is a\n"
+    "status and a header: {\"path\": \"/events\", \"status\": 302, \"headers\": {\"Location\": \"/there\"}}";
 
 int fail(const std::string& why) {
   std::fprintf(stderr, "veltra-lab: %s\n", why.c_str());

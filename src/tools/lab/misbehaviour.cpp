@@ -74,9 +74,12 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   } else if (key == "delayMs") {
     wrong = readInteger(value, 0, 3'600'000, number);
     rule.delay = std::chrono::milliseconds(number);
+  } else if (key == "dripMs") {
+    wrong = readInteger(value, 0, 3'600'000, number);
+    rule.drip = std::chrono::milliseconds(number);
   } else {
-    return "one of path, times, status, delayMs, cut, cutHalfway, stall, endless, sign, lastModified, "
-           "headers, body";
+    return "one of path, times, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
+           "lastModified, headers, body";
   }
   return wrong;
 }

@@ -21,10 +21,11 @@ struct Rule {
   std::optional<std::int64_t> times;  // how many requests it is for; absent: until the reset
   std::optional<int> status;
   std::chrono::milliseconds delay{0};
-  bool cut = false;         // ends the connection without an answer
-  bool cutHalfway = false;  // ends it in the middle of the body
-  bool stall = false;       // no answer until the reset
-  bool endless = false;     // a body without end
+  std::optional<std::chrono::milliseconds> drip;  // the body goes out a byte at a time, this far apart
+  bool cut = false;                               // ends the connection without an answer
+  bool cutHalfway = false;                        // ends it in the middle of the body
+  bool stall = false;                             // no answer until the reset
+  bool endless = false;                           // a body without end
   // wrong: one bit of it is turned; missing: the container has no "signature"; none: the bare storebag, no
   // container
   Signature sign = Signature::right;

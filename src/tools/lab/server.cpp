@@ -89,6 +89,7 @@ struct Server::Library {
   void send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
             const std::optional<Rule>& rule);
   void sendEndless(httplib::Response& response, const std::string& type);
+  void sendDripping(httplib::Response& response, const Answer& answer, std::chrono::milliseconds apart);
 
   Server& lab;
   Connections connections;  // before the server, whose context it watches
@@ -220,7 +221,9 @@ void Server::Library::send(const httplib::Request& request, httplib::Response& r
   for (const auto& [name, text] : answer.headers) response.set_header(name, text.toText().value_or(""));
   if (rule && rule->endless) return sendEndless(response, answer.type);
   if (rule && rule->cutHalfway) return sendAndEnd(response, answer.body, answer.body.size() / 2, answer.type);
-  if (!answer.body.empty()) response.set_content(answer.body, answer.type);
+  if (answer.body.empty()) return;
+  if (rule && rule->drip) return sendDripping(response, answer, *rule->drip);
+  response.set_content(answer.body, answer.type);
 }
 
 void Server::Library::sendEndless(httplib::Response& response, const std::string& type) {
@@ -228,6 +231,19 @@ void Server::Library::sendEndless(httplib::Response& response, const std::string
       type, [this, piece = std::string(kPieceBytes, 'x'), generation = lab._misbehaviour.generation()](
                 std::size_t, httplib::DataSink& sink) {
         return lab._misbehaviour.generation() == generation && sink.write(piece.data(), piece.size());
+      });
+}
+
+// The reset sends what is left at once.
+void Server::Library::sendDripping(httplib::Response& response, const Answer& answer,
+                                   std::chrono::milliseconds apart) {
+  response.set_content_provider(
+      answer.body.size(), answer.type,
+      [this, body = answer.body, apart, generation = lab._misbehaviour.generation()](
+          std::size_t sent, std::size_t left, httplib::DataSink& sink) {
+        if (sent > 0) lab._misbehaviour.hold(apart);
+        const bool reset = lab._misbehaviour.generation() != generation;
+        return sink.write(&body[sent], reset ? left : 1);
       });
 }
 
