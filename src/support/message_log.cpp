@@ -60,9 +60,9 @@ std::string createdText(const std::optional<double>& created) {
   return created ? dateDescription(*created) : "(null)";
 }
 
-// One write at the end of the file. False when anything failed.
+// One write at the end of the file. False when anything failed. A pipe in its place does not hold us up.
 bool append(const std::string& path, const std::string& line) {
-  const int file = open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_CLOEXEC);
+  const int file = open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
   if (file < 0) return false;
   const ssize_t written = write(file, line.data(), line.size());
   const bool closed = close(file) == 0;
@@ -161,7 +161,7 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::createFile() {
 }
 
 void MessageLogFile::remove(const LogFile& file) {
-  unlink(file.path.c_str());
+  ::remove(file.path.c_str());  // an empty directory of such a name, too
   logInfo("writeToLogFile: Deleted expired veltrad log file %s (%s)", file.path.c_str(),
           createdText(file.created).c_str());
 }

@@ -1,0 +1,151 @@
+// The diagnostic message log in a real directory: what is kept, what is deleted, what a fault leaves behind.
+#include "support/message_log.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+
+#include <thread>
+
+#include "fakes/fake_clock.h"
+#include "fakes/recorded_log.h"
+#include "fakes/temporary_directory.h"
+
+namespace veltrad {
+namespace {
+
+using Level = platform::LogLevel;
+using ::testing::ElementsAre;
+
+class MessageLogTest : public ::testing::Test {
+ protected:
+  std::string nameAt(std::int64_t seconds, const char* zeros = "") const {
+    return std::string("veltrad_") + zeros + std::to_string(seconds) + "_messageLog.diag";
+  }
+  std::string dateAt(std::int64_t seconds) const { return "(" + dateDescription(double(seconds)) + ") "; }
+  void write(const std::string& text = "text") { _messages.writeToLogFile("[%@ -> %@", {"b", text}); }
+
+  const std::int64_t _now = ::time(nullptr);
+  const std::string _line = dateAt(_now) + "[b -> text\n";
+  fakes::RecordedLog _log;
+  fakes::TemporaryDirectory _place;
+  fakes::FakeClock _clock{{_now, 900'000}};
+  MessageLogFile _messages{_clock, _place.path()};
+  const std::string _current = _place.path(nameAt(_now));
+};
+
+TEST_F(MessageLogTest, KeepsTheYoungestFileOfADay) {
+  const std::vector<std::string> foreign{"veltrad_1_other.diag", "veltrad_messageLog.diag",
+                                         "veltrad_1_2_messageLog.diag", "xveltrad_1_messageLog.diag"};
+  struct File {
+    std::int64_t age;        // in seconds, by its name and by its times alike
+    const char* zeros = "";  // those with a zero come first in the listing
+  };
+  const std::pair<std::vector<File>, std::optional<File>> cases[] = {
+      {{}, {}},
+      {{{86'395}}, File{86'395}},
+      {{{86'405}}, {}},
+      {{{72'000}, {36'000}}, File{36'000}},
+      {{{72'000}, {36'000, "0"}}, File{36'000, "0"}},
+      {{{5, "0"}, {5}}, File{5, "0"}},
+      {{{90'000}, {9, "0"}, {100'000, "0"}, {10}, {80'000}}, File{9, "0"}}};
+  for (const auto& [files, kept] : cases) {
+    for (const std::string& name : _place.names()) std::filesystem::remove(_place.path(name));
+    for (const std::string& name : foreign) _place.write(name, "foreign");
+    for (const File& file : files) {
+      const std::string name = nameAt(_now - file.age, file.zeros);
+      _place.write(name, "old\n");
+      const timespec times[] = {{_now - file.age, 900'000'000}, {_now - file.age, 900'000'000}};
+      ASSERT_EQ(::utimensat(AT_FDCWD, _place.path(name).c_str(), times, 0), 0);
+    }
+    write();
+    std::vector<std::string> expected = foreign;
+    expected.push_back(kept ? nameAt(_now - kept->age, kept->zeros) : nameAt(_now));
+    EXPECT_THAT(_place.names(), ::testing::UnorderedElementsAreArray(expected));
+    EXPECT_EQ(_place.read(expected.back()), (kept ? "old\n" : "") + _line);
+  }
+}
+
+TEST_F(MessageLogTest, MakesTheDirectoryAndWritesTextsAsTheyAre) {
+  std::filesystem::remove(_place.path());
+  write();
+  write("a\nb %@\n");
+  _messages.writeToLogFile("%@ %@ 5%", {"%@"});
+  const std::string date = dateAt(_now);
+  EXPECT_EQ(_place.read(nameAt(_now)), _line + date + "[b -> a\nb %@\n\n" + date + "%@ %@ 5%\n");
+  _log.expectLine(Level::info, "writeToLogFile: Creating veltrad log directory at " + _place.path());
+  _log.expectLine(Level::info, "writeToLogFile: Created new veltrad log file " + _current + " (20");
+  for (int i = 0; i < 3; ++i)
+    _log.expectLine(Level::info, "writeToLogFile: Saved log message to " + _current);
+}
+
+TEST_F(MessageLogTest, AFileInTheDirectorysPlaceIsTwoErrorLines) {
+  std::filesystem::remove(_place.path());
+  std::ofstream(_place.path()) << "foreign";
+  write();
+  EXPECT_EQ(std::filesystem::file_size(_place.path()), 7u);
+  _log.expectLine(Level::error, "writeToLogFile: Error reading from log directory: Not a directory");
+  _log.expectLine(Level::error, "writeToLogFile: Failed to create new veltrad log file " + _current);
+}
+
+TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) {
+  _place.write("elsewhere", "foreign");
+  rlimit before{};
+  ::getrlimit(RLIMIT_FSIZE, &before);
+  const auto handler = ::signal(SIGXFSZ, SIG_IGN);
+  const std::function<void()> inItsPlace[] = {
+      [&] { std::filesystem::create_symlink("elsewhere", _current); },
+      [&] { ASSERT_EQ(::mkfifo(_current.c_str(), 0600), 0); },
+      [&] { std::filesystem::create_directory(_current); },
+      [&] {
+        std::ofstream(_current) << std::string(4'090, 'x');
+        const rlimit full{4'096, before.rlim_max};  // room for a piece of the line
+        ::setrlimit(RLIMIT_FSIZE, &full);
+      }};
+  for (const auto& put : inItsPlace) {
+    put();
+    write("lost");
+    ::setrlimit(RLIMIT_FSIZE, &before);
+    ASSERT_THAT(_place.names(), ElementsAre("elsewhere"));
+    _log.expectLine(Level::info, "writeToLogFile: Deleted expired veltrad log file " + _current + " (20");
+    write();
+    EXPECT_EQ(_place.read(nameAt(_now)), _line);
+    std::filesystem::remove(_current);
+  }
+  ::signal(SIGXFSZ, handler);
+  EXPECT_EQ(_place.read("elsewhere"), "foreign");
+}
+
+TEST_F(MessageLogTest, AClockThatJumpsLeavesOneFile) {
+  const std::int64_t later = _now + 172'800;
+  write();
+  for (const double jump : {172'800., -172'800.}) {
+    _clock.advance(jump);
+    write();
+    EXPECT_THAT(_place.names(), ElementsAre(nameAt(later)));
+  }
+  EXPECT_EQ(_place.read(nameAt(later)), dateAt(later) + "[b -> text\n" + _line);
+}
+
+TEST_F(MessageLogTest, LinesOfManyThreadsAreWhole) {
+  std::vector<std::thread> threads;
+  for (char c = 'a'; c < 'e'; ++c) {
+    threads.emplace_back([&, c] {
+      for (int i = 0; i < 25; ++i) write(std::string(300, c));
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  ASSERT_THAT(_place.names(), ElementsAre(nameAt(_now)));
+  std::ifstream file(_current);
+  const std::string begin = dateAt(_now) + "[b -> ";
+  std::map<std::string, int> lines;
+  for (std::string line; std::getline(file, line);) ++lines[line];
+  for (char c = 'a'; c < 'e'; ++c) EXPECT_EQ(lines[begin + std::string(300, c)], 25);
+  EXPECT_EQ(lines.size(), 4u);
+}
+
+}  // namespace
+}  // namespace veltrad
