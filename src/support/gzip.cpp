@@ -11,6 +11,8 @@
 namespace veltrad {
 namespace {
 
+// The oldest version whose streams are known to be read.
+constexpr const char* kZlibVersion = "1.2.8";
 constexpr int kMemoryLevel = 8;
 constexpr int kZlibWindowBits = 15;
 constexpr int kGzipWindowBits = 15 + 16;  // a gzip header and trailer in place of zlib's
@@ -78,8 +80,9 @@ std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_vie
   // zlib counts its input in 32 bits; what does not fit must not be cut off silently.
   int result = Z_STREAM_ERROR;
   if (bytes.size() <= std::numeric_limits<uInt>::max()) {
-    result = deflateInit2(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED,
-                          gzip ? kGzipWindowBits : kZlibWindowBits, kMemoryLevel, Z_DEFAULT_STRATEGY);
+    result =
+        deflateInit2_(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, gzip ? kGzipWindowBits : kZlibWindowBits,
+                      kMemoryLevel, Z_DEFAULT_STRATEGY, kZlibVersion, sizeof stream);
   }
   if (result != Z_OK) {
     logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",

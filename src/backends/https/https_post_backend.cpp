@@ -1,6 +1,8 @@
 // The HTTPS post backend: what becomes of a message, and the flush. Its state stands in https_post_state.cpp.
 #include "backends/https/https_post_backend.h"
 
+#include <fmt/printf.h>
+
 #include "backends/https/event.h"
 #include "backends/https/json_message.h"
 #include "config/process_settings.h"
@@ -251,7 +253,7 @@ void HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result, std::siz
   const PostVerdict verdict = verdictOfStatus(status);
   if (verdict.disablesBackend) {
     const std::string text =
-        "backend " + name() + " disabled by server " + std::to_string(verdict.status) + " return code";
+        fmt::sprintf("backend %s disabled by server %d return code", name(), verdict.status);
     logInfo("postJSONMessage: %s", text.c_str());
     setState(kBackendDisabled);
     error = makeReportingError(text, verdict.status);
