@@ -46,6 +46,7 @@ class Process:
 
     def __init__(self, arguments, env, stream="stderr", **options):
         options.setdefault(stream, subprocess.PIPE)
+        options.setdefault("start_new_session", True)  # a Ctrl-C is ours; it ends them in order
         self.lines, self._news = [], threading.Condition()
         self.popen = subprocess.Popen(arguments, env=env, **options)
         self._stream = getattr(self.popen, stream)
@@ -140,10 +141,11 @@ class Root:
 class Lab:
     _keys = None  # made once a test process; later labs start with a copy
 
-    def __init__(self, *arguments):
+    def __init__(self, *arguments, own_certificate=False):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-lab-"))
         if Lab._keys:
-            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True)
+            ignored = shutil.ignore_patterns("certificate*") if own_certificate else None
+            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True, ignore=ignored)
         command = [program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments]
         self.process = Process(command, None, "stdout")
         try:
