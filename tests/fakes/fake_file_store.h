@@ -1,4 +1,4 @@
-// Files in memory, on a disk that can fail, fill up and lose what was not synced. Any thread.
+// Files in memory, on a disk that can fail and fill up. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -33,7 +33,6 @@ class FakeFileStore final : public platform::FileStore {
     if (_writeFailure) return failureOf(path, *_writeFailure);
     _files[path] = {std::string(bytes), mode, ++_lastStamp};
     ++_replaced;
-    if (_syncs) _synced = _files;
     return std::nullopt;
   }
   std::optional<platform::FileFailure> rename(const std::string& from, const std::string& to) override {
@@ -43,7 +42,6 @@ class FakeFileStore final : public platform::FileStore {
     if (file == _files.end()) return failureOf(from, Kind::notFound);
     _files[to] = file->second;
     _files.erase(from);
-    if (_syncs) _synced = _files;
     return std::nullopt;
   }
   std::optional<std::uint64_t> stamp(const std::string& path) override {
@@ -52,16 +50,14 @@ class FakeFileStore final : public platform::FileStore {
     return file == _files.end() ? std::nullopt : std::optional(file->second.stamp);
   }
 
-  // What somebody else does to the disk; always synced, never fails.
+  // What somebody else does to the disk; never fails.
   void put(const std::string& path, std::string_view bytes) {
     std::lock_guard lock(_mutex);
     _files[path] = {std::string(bytes), 0644, ++_lastStamp};
-    _synced[path] = _files[path];
   }
   void remove(const std::string& path) {
     std::lock_guard lock(_mutex);
     _files.erase(path);
-    _synced.erase(path);
   }
   std::optional<std::string> bytes(const std::string& path) const {
     std::lock_guard lock(_mutex);
@@ -88,15 +84,6 @@ class FakeFileStore final : public platform::FileStore {
     _readFailures.erase(path);
     if (kind) _readFailures.emplace(path, *kind);
   }
-  // A disk that says it has synced and has not: crash() loses what was written since.
-  void pretendToSync(bool pretend) {
-    std::lock_guard lock(_mutex);
-    _syncs = !pretend;
-  }
-  void crash() {
-    std::lock_guard lock(_mutex);
-    _files = _synced;
-  }
 
  private:
   struct File {
@@ -106,27 +93,16 @@ class FakeFileStore final : public platform::FileStore {
   };
 
   static platform::FileFailure failureOf(const std::string& path, Kind kind) {
-    switch (kind) {
-      case Kind::notFound:
-        return {kind, path + ": No such file or directory"};
-      case Kind::noAccess:
-        return {kind, path + ": Permission denied"};
-      case Kind::tooLarge:
-        return {kind, path + ": larger than was asked for"};
-      case Kind::noSpace:
-        return {kind, path + ": No space left on device"};
-      case Kind::other:
-        break;
-    }
-    return {kind, path + ": Input/output error"};
+    static const char* const kTexts[] = {"No such file or directory", "Permission denied",
+                                         "larger than was asked for", "No space left on device",
+                                         "Input/output error"};
+    return {kind, path + ": " + kTexts[static_cast<int>(kind)]};
   }
 
   mutable std::mutex _mutex;
   std::map<std::string, File> _files;
-  std::map<std::string, File> _synced;
   std::map<std::string, Kind> _readFailures;
   std::optional<Kind> _writeFailure;
-  bool _syncs = true;
   int _replaced = 0;
   std::uint64_t _lastStamp = 0;
 };

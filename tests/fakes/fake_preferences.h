@@ -1,4 +1,4 @@
-// Preferences in memory, which can refuse to be written. Any thread.
+// Preferences in memory. Any thread.
 #pragma once
 
 #include <map>
@@ -21,33 +21,23 @@ class FakePreferences final : public platform::Preferences {
   }
   bool setValue(std::string_view domain, std::string_view key, const Value& value) override {
     std::lock_guard lock(_mutex);
-    if (_refusesWrites) return false;
     _values.insert_or_assign(name(domain, key), value);
     return true;
   }
   std::string textOrStore(std::string_view domain, std::string_view key, std::string (*make)()) override {
     std::lock_guard lock(_mutex);
-    auto found = _values.find(name(domain, key));
-    if (found != _values.end()) {
-      if (const auto text = found->second.toText(); text && !text->empty()) return *text;
-    }
-    const std::string made = make();
-    _values.insert_or_assign(name(domain, key), Value(made));  // as long as the process, stored or not
-    return made;
+    Value& stored = _values.try_emplace(name(domain, key), "").first->second;
+    if (const auto text = stored.toText(); !text || text->empty()) stored = make();
+    return *stored.toText();
   }
 
   // In the domain kVeltraPreferenceDomain.
   void set(std::string_view key, const Value& value) {
-    std::lock_guard lock(_mutex);
-    _values.insert_or_assign(name(platform::kVeltraPreferenceDomain, key), value);
+    setValue(platform::kVeltraPreferenceDomain, key, value);
   }
   void remove(std::string_view key) {
     std::lock_guard lock(_mutex);
     _values.erase(name(platform::kVeltraPreferenceDomain, key));
-  }
-  void refuseWrites(bool refuse) {
-    std::lock_guard lock(_mutex);
-    _refusesWrites = refuse;
   }
 
  private:
@@ -58,7 +48,6 @@ class FakePreferences final : public platform::Preferences {
 
   std::mutex _mutex;
   std::map<Name, Value> _values;
-  bool _refusesWrites = false;
 };
 
 }  // namespace veltrad::inline fakes

@@ -17,24 +17,13 @@ class FakeRandom final : public platform::Random {
     std::lock_guard lock(_mutex);
     const double draw = _draws.at(_next);
     if (_next + 1 < _draws.size()) ++_next;
-    ++_drawn;
     return draw;
-  }
-  void set(std::vector<double> draws) {
-    std::lock_guard lock(_mutex);
-    _draws = std::move(draws);
-    _next = 0;
-  }
-  int drawn() const {
-    std::lock_guard lock(_mutex);
-    return _drawn;
   }
 
  private:
-  mutable std::mutex _mutex;
-  std::vector<double> _draws;
+  std::mutex _mutex;
+  const std::vector<double> _draws;
   std::size_t _next = 0;
-  int _drawn = 0;
 };
 
 }  // namespace veltrad::inline fakes

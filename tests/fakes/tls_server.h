@@ -28,86 +28,61 @@
 
 namespace veltrad {
 
-// One certificate authority and one certificate by it, valid for `names` ("DNS:localhost,IP:127.0.0.1").
+// A certificate that vouches for itself, valid for `names` ("DNS:localhost,IP:127.0.0.1").
 class TestCertificates {
  public:
-  explicit TestCertificates(const std::string& names = "DNS:localhost,IP:127.0.0.1",
-                            const std::string& authority = "Test authority")
-      : _authorityKey(EVP_EC_gen("P-256")),
-        _key(EVP_EC_gen("P-256")),
-        _authority(make(authority, "CA:TRUE", "", _authorityKey, nullptr)),
-        _certificate(make("localhost", "CA:FALSE", names, _key, _authority)) {}
-  ~TestCertificates() {
-    X509_free(_certificate);
-    X509_free(_authority);
-    EVP_PKEY_free(_key);
-    EVP_PKEY_free(_authorityKey);
+  explicit TestCertificates(const std::string& names = "DNS:localhost,IP:127.0.0.1")
+      : _key(EVP_EC_gen("P-256")), _certificate(X509_new()) {
+    X509* made = _certificate.get();
+    X509_set_version(made, X509_VERSION_3);
+    ASN1_INTEGER_set(X509_get_serialNumber(made), 1);
+    X509_gmtime_adj(X509_getm_notBefore(made), -3600);
+    X509_gmtime_adj(X509_getm_notAfter(made), 24 * 3600);
+    X509_set_pubkey(made, _key.get());
+    X509_NAME* name = X509_get_subject_name(made);
+    X509_NAME_add_entry_by_txt(name, "CN", MBSTRING_ASC, reinterpret_cast<const unsigned char*>("Test"), -1,
+                               -1, 0);
+    X509_set_issuer_name(made, name);
+    X509_EXTENSION* extension = X509V3_EXT_conf_nid(nullptr, nullptr, NID_subject_alt_name, names.c_str());
+    if (X509_add_ext(made, extension, -1) != 1 || X509_sign(made, _key.get(), EVP_sha256()) == 0)
+      std::abort();
+    X509_EXTENSION_free(extension);
   }
-  TestCertificates(const TestCertificates&) = delete;
-  TestCertificates& operator=(const TestCertificates&) = delete;
 
   std::string authorityPEM() const {
-    BIO* memory = BIO_new(BIO_s_mem());
-    PEM_write_bio_X509(memory, _authority);
+    const std::unique_ptr<BIO, decltype(&BIO_free)> memory(BIO_new(BIO_s_mem()), BIO_free);
+    PEM_write_bio_X509(memory.get(), _certificate.get());
     char* text = nullptr;
-    const long length = BIO_get_mem_data(memory, &text);
-    std::string pem(text, static_cast<std::size_t>(length));
-    BIO_free(memory);
-    return pem;
+    const long length = BIO_get_mem_data(memory.get(), &text);
+    return {text, static_cast<std::size_t>(length)};
   }
   void use(SSL_CTX* context) const {
-    if (SSL_CTX_use_certificate(context, _certificate) != 1 || SSL_CTX_use_PrivateKey(context, _key) != 1)
+    if (SSL_CTX_use_certificate(context, _certificate.get()) != 1 ||
+        SSL_CTX_use_PrivateKey(context, _key.get()) != 1)
       std::abort();
   }
 
  private:
-  static void extend(X509* certificate, X509* issuer, int kind, const std::string& value) {
-    X509V3_CTX context;
-    X509V3_set_ctx(&context, issuer, certificate, nullptr, nullptr, 0);
-    X509_EXTENSION* extension = X509V3_EXT_conf_nid(nullptr, &context, kind, value.c_str());
-    if (extension == nullptr || X509_add_ext(certificate, extension, -1) != 1) std::abort();
-    X509_EXTENSION_free(extension);
-  }
-  X509* make(const std::string& name, const char* constraint, const std::string& names, EVP_PKEY* key,
-             X509* issuer) {
-    X509* certificate = X509_new();
-    X509_set_version(certificate, X509_VERSION_3);
-    ASN1_INTEGER_set(X509_get_serialNumber(certificate), issuer == nullptr ? 1 : 2);
-    X509_gmtime_adj(X509_getm_notBefore(certificate), -3600);
-    X509_gmtime_adj(X509_getm_notAfter(certificate), 24 * 3600);
-    X509_set_pubkey(certificate, key);
-    X509_NAME_add_entry_by_txt(X509_get_subject_name(certificate), "CN", MBSTRING_ASC,
-                               reinterpret_cast<const unsigned char*>(name.c_str()), -1, -1, 0);
-    X509* signer = issuer == nullptr ? certificate : issuer;
-    X509_set_issuer_name(certificate, X509_get_subject_name(signer));
-    extend(certificate, signer, NID_basic_constraints, constraint);
-    if (!names.empty()) extend(certificate, signer, NID_subject_alt_name, names);
-    if (X509_sign(certificate, _authorityKey, EVP_sha256()) == 0) std::abort();
-    return certificate;
-  }
-
-  EVP_PKEY* _authorityKey;
-  EVP_PKEY* _key;
-  X509* _authority;
-  X509* _certificate;
+  template <auto release>
+  struct Release {
+    void operator()(auto* object) const { release(object); }
+  };
+  const std::unique_ptr<EVP_PKEY, Release<EVP_PKEY_free>> _key;
+  const std::unique_ptr<X509, Release<X509_free>> _certificate;
 };
 
 struct TLSRequest {
   std::string head;  // request line and headers as they came, with the empty line
   std::string body;
-  std::size_t connection = 0;  // counted from 1
 };
 
 struct TLSAnswer {
   enum class Shape {
     whole,
-    chunked,      // the body in chunks of 7 bytes
-    byteByByte,   // every byte a record of its own
     cut,          // "Content-Length" is the body's, half of it comes, then the end
     silent,       // nothing until the server ends
     endless,      // a chunked body without end
     endlessHead,  // headers without end
-    closed,       // the connection ends instead of an answer
   };
   int status = 200;
   std::vector<std::pair<std::string, std::string>> headers = {};
@@ -162,13 +137,13 @@ class TLSServer {
     return _requests;
   }
   // False when fewer came in time.
-  bool waitForRequests(std::size_t count, std::chrono::milliseconds within = std::chrono::seconds(20)) const {
+  bool waitForRequests(std::size_t count) const {
     std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, within, [&] { return _requests.size() >= count; });
+    return _changed.wait_for(lock, std::chrono::seconds(20), [&] { return _requests.size() >= count; });
   }
-  bool waitForRefusedHandshake(std::chrono::milliseconds within = std::chrono::seconds(20)) const {
+  bool waitForRefusedHandshake() const {
     std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, within, [&] { return _refusedHandshakes > 0; });
+    return _changed.wait_for(lock, std::chrono::seconds(20), [&] { return _refusedHandshakes > 0; });
   }
   std::size_t connections() const {
     const std::lock_guard lock(_mutex);
@@ -192,17 +167,17 @@ class TLSServer {
       }
       _open.insert(fd);
       _mostOpen = std::max(_mostOpen, _open.size());
-      _threads.emplace_back([this, fd, number = ++_connections] { serve(fd, number); });
+      ++_connections;
+      _threads.emplace_back([this, fd] { serve(fd); });
     }
   }
 
-  void serve(int fd, std::size_t number) {
+  void serve(int fd) {
     SSL* tls = SSL_new(_context);
     SSL_set_fd(tls, fd);
     if (SSL_accept(tls) == 1) {
       std::string received;
       TLSRequest request;
-      request.connection = number;
       while (read(tls, received, request) && answer(tls, request)) {
       }
     } else {
@@ -242,56 +217,38 @@ class TLSServer {
   }
 
   static bool write(SSL* tls, const std::string& bytes) {
-    return bytes.empty() || SSL_write(tls, bytes.data(), static_cast<int>(bytes.size())) > 0;
+    return SSL_write(tls, bytes.data(), static_cast<int>(bytes.size())) > 0;
   }
-  static std::string chunk(const std::string& bytes) {
-    char size[24];
-    std::snprintf(size, sizeof size, "%zx\r\n", bytes.size());
-    return size + bytes + "\r\n";
+  static bool writeForEver(SSL* tls, const std::string& bytes) {
+    while (write(tls, bytes)) {
+    }
+    return false;
   }
 
   // False: the connection ends.
   bool answer(SSL* tls, const TLSRequest& request) {
     using Shape = TLSAnswer::Shape;
     const TLSAnswer answer = _script(request);
-    const bool chunked = answer.shape == Shape::chunked || answer.shape == Shape::endless;
     std::string head = "HTTP/1.1 " + std::to_string(answer.status) + " Text\r\n";
     for (const auto& [name, value] : answer.headers) head += name + ": " + value + "\r\n";
-    head += chunked ? "Transfer-Encoding: chunked\r\n\r\n"
-                    : "Content-Length: " + std::to_string(answer.body.size()) + "\r\n\r\n";
+    const std::string whole =
+        head + "Content-Length: " + std::to_string(answer.body.size()) + "\r\n\r\n" + answer.body;
     switch (answer.shape) {
-      case Shape::closed:
-        return false;
       case Shape::whole:
-        return write(tls, head + answer.body);
+        return write(tls, whole);
       case Shape::cut:
-        write(tls, head + answer.body.substr(0, answer.body.size() / 2));
+        write(tls, whole.substr(0, whole.size() - answer.body.size() / 2));
         return false;
       case Shape::silent: {
         std::unique_lock lock(_mutex);
         _changed.wait(lock, [this] { return _ending; });
         return false;
       }
-      case Shape::chunked: {
-        std::string all = head;
-        for (std::size_t at = 0; at < answer.body.size(); at += 7) all += chunk(answer.body.substr(at, 7));
-        return write(tls, all + "0\r\n\r\n");
-      }
-      case Shape::byteByByte:
-        for (const char byte : head + answer.body) {
-          if (!write(tls, std::string(1, byte))) return false;
-        }
-        return true;
       case Shape::endless:
-        if (!write(tls, head)) return false;
-        while (write(tls, chunk(std::string(4096, 'x')))) {
-        }
-        return false;
+        return write(tls, head + "Transfer-Encoding: chunked\r\n\r\n") &&
+               writeForEver(tls, "400\r\n" + std::string(1024, 'x') + "\r\n");
       case Shape::endlessHead:
-        if (!write(tls, "HTTP/1.1 200 Text\r\n")) return false;
-        while (write(tls, "X-More: " + std::string(1000, 'x') + "\r\n")) {
-        }
-        return false;
+        return write(tls, head) && writeForEver(tls, "X-More: " + std::string(1000, 'x') + "\r\n");
     }
     return false;
   }

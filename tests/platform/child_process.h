@@ -1,8 +1,8 @@
 // A piece of a test in a process of its own. Test thread, while no other runs.
 #pragma once
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
-#include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -14,59 +14,36 @@
 
 namespace veltrad::inline fakes {
 
-// The child says what it found on a pipe; `body` is its whole life. A child that is still there is killed.
+// The child says what it found, a line at a time; `body` is its whole life.
 class ChildProcess {
  public:
   using Say = std::function<void(std::string_view)>;
 
-  explicit ChildProcess(const std::function<int(const Say&)>& body) {
+  explicit ChildProcess(const std::function<void(const Say&)>& body) {
     int ends[2];
     if (::pipe(ends) != 0) return;
-    _pid = ::fork();
-    if (_pid == 0) {
-      ::close(ends[0]);
+    pid = ::fork();
+    if (pid == 0) {
       ::alarm(60);
-      ::_exit(body([&](std::string_view text) {
+      const int out = ::fcntl(ends[1], F_DUPFD, 100);  // leaves the low numbers to the body
+      ::close(ends[0]);
+      ::close(ends[1]);
+      body([&](std::string_view text) {
         const std::string line = std::string(text) + "\n";
-        if (::write(ends[1], line.data(), line.size()) < 0) ::_exit(99);
-      }));
+        if (::write(out, line.data(), line.size()) < 0) ::_exit(99);
+      });
+      ::_exit(0);
     }
     ::close(ends[1]);
-    _said.reset(ends[0]);
-  }
-  ~ChildProcess() {
-    if (_pid <= 0) return;
-    ::kill(_pid, SIGKILL);
-    ::waitpid(_pid, nullptr, 0);
-  }
-  ChildProcess(const ChildProcess&) = delete;
-  ChildProcess& operator=(const ChildProcess&) = delete;
-
-  pid_t pid() const { return _pid; }
-  void send(int signal) const { ::kill(_pid, signal); }
-  // The next line; empty when the child has gone.
-  std::string nextLine() const {
-    std::string line;
-    for (char c = 0; ::read(_said.get(), &c, 1) == 1 && c != '\n';) line += c;
-    return line;
-  }
-  // Everything that is left to say.
-  std::string rest() const {
-    std::string text;
-    for (char c = 0; ::read(_said.get(), &c, 1) == 1;) text += c;
-    return text;
-  }
-  // Waits for the end: the exit status, or minus the signal's number.
-  int wait() {
+    const platform::FileDescriptor in(ends[0]);
+    for (char c = 0; ::read(in.get(), &c, 1) == 1;) said += c;
     int status = 0;
-    ::waitpid(_pid, &status, 0);
-    _pid = 0;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+    ::waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0) << "the child ended badly";
   }
 
- private:
-  pid_t _pid = 0;
-  platform::FileDescriptor _said;
+  pid_t pid = 0;  // of the child, which has ended
+  std::string said;
 };
 
 }  // namespace veltrad::inline fakes

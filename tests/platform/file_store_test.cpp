@@ -12,7 +12,6 @@
 namespace veltrad::platform {
 namespace {
 
-using ::testing::ElementsAre;
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::UnorderedElementsAre;
@@ -27,48 +26,37 @@ class DiskFileStoreTest : public ::testing::Test {
 };
 
 TEST_F(DiskFileStoreTest, ReplacesWholeWithTheModeAskedForAndLeavesNothingElse) {
-  _directory.write("x", "old");
+  _directory.write("elsewhere", "untouched");
+  std::filesystem::create_symlink("elsewhere", _directory.path("x"));
   const mode_t before = ::umask(077);
   ASSERT_FALSE(_files.replace(_directory.path("x"), std::string_view("a\0b", 3), 0644));
   ::umask(before);
   EXPECT_EQ(_files.read(_directory.path("x"), kMost).value(), std::string("a\0b", 3));
   struct stat status {};
-  ASSERT_EQ(::stat(_directory.path("x").c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 0777, 0644u);
-  EXPECT_THAT(_directory.names(), ElementsAre("x"));
+  ASSERT_EQ(::lstat(_directory.path("x").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode, S_IFREG | 0644u);
+  EXPECT_EQ(_directory.read("elsewhere"), "untouched");
+  EXPECT_THAT(_directory.names(), UnorderedElementsAre("elsewhere", "x"));
 }
 
-TEST_F(DiskFileStoreTest, AFullDiskLeavesTheOldFileAndNoNewOne) {
+TEST_F(DiskFileStoreTest, AFailureLeavesTheOldFileAndNoNewOne) {
   _directory.write("x", "old");
+  std::filesystem::create_directory(_directory.path("directory"));
   rlimit before{};
   ::getrlimit(RLIMIT_FSIZE, &before);
   const auto handler = ::signal(SIGXFSZ, SIG_IGN);
   const rlimit small{4'096, before.rlim_max};
   ::setrlimit(RLIMIT_FSIZE, &small);
-  const auto failure = _files.replace(_directory.path("x"), std::string(10'000, 'n'), 0600);
+  const auto full = _files.replace(_directory.path("x"), std::string(10'000, 'n'), 0600);
   ::setrlimit(RLIMIT_FSIZE, &before);
   ::signal(SIGXFSZ, handler);
-
-  ASSERT_TRUE(failure);
-  EXPECT_EQ(failure->kind, Kind::tooLarge);
+  ASSERT_TRUE(full);
+  EXPECT_EQ(full->kind, Kind::tooLarge);
   EXPECT_EQ(_directory.read("x"), "old");
-  EXPECT_THAT(_directory.names(), ElementsAre("x"));
-}
-
-TEST_F(DiskFileStoreTest, ARenameThatFailsLeavesNoNewFile) {
-  std::filesystem::create_directory(_directory.path("x"));
-  const auto failure = _files.replace(_directory.path("x"), "new", 0600);
-  ASSERT_TRUE(failure);
-  EXPECT_THAT(failure->description, HasSubstr(_directory.path("x") + ": "));
-  EXPECT_THAT(_directory.names(), ElementsAre("x"));
-}
-
-TEST_F(DiskFileStoreTest, ReplacesALinkInsteadOfWritingThroughIt) {
-  _directory.write("elsewhere", "untouched");
-  std::filesystem::create_symlink("elsewhere", _directory.path("x"));
-  ASSERT_FALSE(_files.replace(_directory.path("x"), "new", 0600));
-  EXPECT_EQ(_directory.read("elsewhere"), "untouched");
-  EXPECT_FALSE(std::filesystem::is_symlink(_directory.path("x")));
+  const auto occupied = _files.replace(_directory.path("directory"), "new", 0600);
+  ASSERT_TRUE(occupied);
+  EXPECT_THAT(occupied->description, HasSubstr(_directory.path("directory") + ": "));
+  EXPECT_THAT(_directory.names(), UnorderedElementsAre("x", "directory"));
 }
 
 TEST_F(DiskFileStoreTest, ReadsWithinItsBoundAndRegularFilesAlone) {
