@@ -101,12 +101,4 @@ void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSessio
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
-// Every session is a root as long as no back end takes a hierarchy number from its client entry: there is
-// nobody below to refresh.
-void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) {
-  if (!session->userInfo()) {
-    logInfo("updateDownstreamSessions: No user info found for session %u", session->sessionID());
-  }
-}
-
 }  // namespace veltrad

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "base/mutex.h"
+#include "daemon/correlated_list.h"
 #include "daemon/storebag_cache.h"
 #include "protocol/connection.h"
 #include "session/session_delegate.h"
@@ -31,6 +32,10 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
   std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const VeltradSession& session) override;
   void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) override;
+  std::optional<std::string> parentSessionIDStringForSession(const VeltradSession& session) override;
+  std::shared_ptr<VeltradSession> parentSessionForChild(const VeltradSession& session) override;
+  bool withAncestorAggregator(const VeltradSession& session,
+                              const std::function<void(VeltradSession&)>& use) override;
   void updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) override;
   std::string description() const override;
 
@@ -42,6 +47,10 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
   void addSession(std::shared_ptr<VeltradSession> session);
   void sessionInvalidated(const std::shared_ptr<VeltradSession>& session);
   void leaveCorrelatedList(const std::shared_ptr<VeltradSession>& session) REQUIRES(_lock);
+  // The sessions that share the session's key, in the order of joining; null where the key has no list.
+  const CorrelatedList* correlatedList(const VeltradSession& session) const REQUIRES(_lock);
+  std::shared_ptr<VeltradSession> getAncestorWithAggregatorForSession(const VeltradSession& session) const
+      REQUIRES(_lock);
 
   // Constant after construction.
   const SessionServices _services;
@@ -54,7 +63,7 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
   RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
   StorebagCache _cachedStorebags GUARDED_BY(_lock);
   // Lists stay when they become empty. A session is in at most one: that of the key it is remembered under.
-  std::map<std::string, std::vector<std::shared_ptr<VeltradSession>>> _correlatedSessions GUARDED_BY(_lock);
+  std::map<std::string, CorrelatedList> _correlatedSessions GUARDED_BY(_lock);
   std::map<const VeltradSession*, std::string> _keyOfSession GUARDED_BY(_lock);
 
   // Kept beside the collections.

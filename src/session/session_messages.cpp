@@ -5,10 +5,18 @@
 #include "protocol/connection.h"
 #include "protocol/constants.h"
 #include "session/flush_counters.h"
+#include "session/one_shot.h"
+#include "session/session_delegate.h"
 #include "session/veltrad_session.h"
 #include "support/message_log.h"
 
 namespace veltrad {
+
+namespace {
+void logProxyFailure(const std::optional<std::string>& failure) {
+  if (failure) logError("sendMessageWithDictionary: Failed to get remote object proxy: %s", failure->c_str());
+}
+}  // namespace
 
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                              OptionalDictionary payload, StringReply reply) {
@@ -63,7 +71,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count("message taken in");
-  if (hasAggregator()) {
+  if (hasAggregator() || getSessionHierarchy() > 0) {
     aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
   }
   return offerToBackends(*set, payload, time, category16, type16, flag);
@@ -97,23 +105,39 @@ void VeltradSession::aggregateMessage(const SharedDictionary& info, double times
     merged = *payload;
     if (const SharedDictionary mine = userInfo()) merged->merge(*mine);
   }
-  sendToAggregator(info, timestamp, category, type, std::move(merged));
+  std::optional<std::string> failure;
+  // A root has no ancestors, so it needs no look at them and no lock of the registry's.
+  const bool toAncestor = getSessionHierarchy() > 0 &&
+                          _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
+                            failure =
+                                ancestor.sendToAggregator(info, timestamp, category, type, std::move(merged));
+                          });
+  if (!toAncestor && hasAggregator()) {
+    failure = sendToAggregator(info, timestamp, category, type, std::move(merged));
+  }
+  logProxyFailure(failure);
 }
 
-void VeltradSession::sendToAggregator(const SharedDictionary& info, double timestamp, std::uint16_t category,
-                                      std::uint16_t type, OptionalDictionary payload) {
-  if (!_connection) return;
-  const auto proxy = _connection->remoteObjectProxyWithErrorHandler([](const std::string& description) {
-    logError("sendMessageWithDictionary: Failed to get remote object proxy: %s", description.c_str());
-  });
+std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictionary& info, double timestamp,
+                                                            std::uint16_t category, std::uint16_t type,
+                                                            OptionalDictionary payload) {
+  std::shared_ptr<Connection> connection;
+  {
+    const Lock held(_mutex);
+    connection = _connection;
+  }
+  if (!connection) return "The session has ended.";
+  std::optional<std::string> failure;
+  const auto proxy = connection->remoteObjectProxyWithErrorHandler(
+      [&failure](const std::string& description) { failure = description; });
   proxy->sendMessageToClient(info ? OptionalDictionary(*info) : std::nullopt, timestamp, category, type,
                              std::move(payload));
+  return failure;
 }
 
 void VeltradSession::shutdownSessionAggregation() {
   logDebug("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
-  if (hasAggregator()) sendToAggregator(nullptr, 0, 0, 0, std::nullopt);
-  _hasAggregator.store(false, std::memory_order_relaxed);
+  if (_hasAggregator.exchange(false)) logProxyFailure(sendToAggregator(nullptr, 0, 0, 0, std::nullopt));
 }
 
 void VeltradSession::flushMessagesWithCompletion(FlushReply completion) {
@@ -176,10 +200,36 @@ void VeltradSession::uploadLogData(Array logData, UploadLogDataReply completionH
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
 
-// Not served yet: the reply goes unanswered, which the client is told.
-void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t,
-                                                std::uint16_t, OptionalDictionary, StringReply) {
-  _services.counters.count("message dropped: one-shot messages are not served yet");
+void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, OptionalDictionary userInfo,
+                                                std::uint16_t category, std::uint16_t type,
+                                                OptionalDictionary payload, StringReply reply) {
+  if (!info || !info->contains(kVeltraSessionInfoClientType) ||
+      !info->contains(kVeltraSessionInfoSessionID)) {
+    logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
+    _services.counters.count("message dropped: a one-shot message without client type or session ID");
+    return;  // the reply is never given, which ends the client's call
+  }
+  _sessionID.store(info->uint32(kVeltraSessionInfoSessionID).value_or(0), std::memory_order_relaxed);
+  const auto kept = std::make_shared<const Dictionary>(std::move(*info));
+  const SharedDictionary identity =
+      userInfo ? std::make_shared<const Dictionary>(std::move(*userInfo)) : nullptr;
+  {
+    const Lock held(_mutex);
+    _sessionInfo = kept;
+  }
+  receivedUserInfo(identity);
+  logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
+  const SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  if (!storebag) {
+    _services.counters.count("message dropped: no storebag for a one-shot message");
+    if (reply) reply("storebag not available");
+    return;
+  }
+  _services.counters.count("message taken in: one-shot");
+  veltrad::sendMessageWithSessionInfo(
+      {_services.factory, _services.device, _services.library, _services.clock}, _services.messageLog,
+      {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
+  if (reply) reply("finished");
 }
 
 }  // namespace veltrad

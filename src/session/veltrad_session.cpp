@@ -226,6 +226,43 @@ std::int32_t VeltradSession::getSessionHierarchy() const {
   return 0;
 }
 
+void VeltradSession::syncReportingStates() {
+  const auto mine = backends();
+  const auto parent = _sessionDelegate.parentSessionForChild(*this);
+  const auto theirs = parent ? parent->backends() : nullptr;
+  if (!mine) return;
+  for (const auto& [name, backend] : *mine) {
+    if (!parent) {
+      if (backend->hierarchy() >= 1) {
+        logInfo("syncReportingStates: child session %u (backend %s) with hierarchy %d is missing its parent",
+                sessionID(), backend->name().c_str(), backend->hierarchy());
+      }
+      continue;
+    }
+    if (backend->state() == kBackendHeld) continue;
+    const auto at = theirs ? theirs->find(name) : BackendSet::const_iterator();
+    if (!theirs || at == theirs->end()) {
+      backend->setState(kBackendDisabled);
+      continue;
+    }
+    backend->setState(at->second->state());
+    backend->setSamplingThreshold(at->second->samplingThreshold());
+    logDebug("HTTPSPostBackend(syncReportingStates): %s: state and sampling rate updated to %d, %.02f%%",
+             backend->name().c_str(), backend->state(), backend->samplingThreshold().value_or(0));
+  }
+}
+
+void VeltradSession::updateCombinedSessionID() {
+  const auto ancestors = _sessionDelegate.parentSessionIDStringForSession(*this);
+  if (!ancestors) return;
+  const std::string combined = *ancestors + "." + _sessionIDString;
+  logDebug("updateCombinedSessionID: Updating combined session ID '%s' for session %u backends",
+           combined.c_str(), sessionID());
+  if (const auto set = backends()) {
+    for (const auto& [name, backend] : *set) backend->setCorrelatedSessionID(combined);
+  }
+}
+
 void VeltradSession::end() {
   logDebug("dealloc: VeltradSession dealloc: %u", sessionID());
   Dictionary payload;
@@ -234,9 +271,11 @@ void VeltradSession::end() {
   flushMessagesWithCompletion(nullptr);
   shutdownSessionAggregation();
   std::shared_ptr<const BackendSet> released;
+  std::shared_ptr<Connection> connection;  // may be the last reference: goes after the lock
   {
     const Lock held(_mutex);
     released.swap(_backends);
+    connection.swap(_connection);
     _sessionInfo = nullptr;
     _userInfo = nullptr;
     _storebagVersion = std::nullopt;
@@ -245,7 +284,6 @@ void VeltradSession::end() {
     for (const auto& [name, backend] : *released) backend->cleanup();
   }
   _frameworks = std::nullopt;
-  _connection = nullptr;
 }
 
 }  // namespace veltrad

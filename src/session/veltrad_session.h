@@ -79,6 +79,12 @@ class VeltradSession final : public ClientSessionInterface,
   bool hasAggregator() const { return _hasAggregator.load(std::memory_order_relaxed); }
   // The number that the HTTPS post backend takes from its client entry; 0: root.
   std::int32_t getSessionHierarchy() const;
+  // For the registry, which holds its lock: takes over the parent's states and sampling thresholds, back end
+  // by back end; one in state 3 keeps its own, one that the parent lacks is disabled.
+  void syncReportingStates();
+  // Gives the back ends the ancestors' ID strings and this session's own, joined by ".".
+  void updateCombinedSessionID();
+  void shutdownSessionAggregation();
   // The client type of the session info, for the choice of a storebag; absent when it names none.
   std::optional<std::int32_t> clientType() const;
 
@@ -99,9 +105,11 @@ class VeltradSession final : public ClientSessionInterface,
   std::optional<std::string> sendMessageWithDictionary(const Dictionary& message);
   void aggregateMessage(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
                         std::uint16_t type, const Dictionary* payload);
-  void sendToAggregator(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
-                        std::uint16_t type, OptionalDictionary payload);
-  void shutdownSessionAggregation();
+  // To this session's own client, without waiting; the registry's lock may be held. The reason why it could
+  // not be.
+  std::optional<std::string> sendToAggregator(const SharedDictionary& sessionInfo, double timestamp,
+                                              std::uint16_t category, std::uint16_t type,
+                                              OptionalDictionary payload);
   std::optional<std::string> offerToBackends(const BackendSet& backends, const Dictionary* payload,
                                              platform::TimeValue time, std::uint16_t category,
                                              std::uint16_t type, std::int32_t flag);
@@ -118,13 +126,13 @@ class VeltradSession final : public ClientSessionInterface,
   char _deviceid[41] = {};             // NUL-terminated; all zero when the device has no identifier
 
   // The connection's thread only.
-  std::shared_ptr<Connection> _connection;
   std::optional<Array> _frameworks;  // kept, not interpreted
 
   std::atomic<std::uint32_t> _sessionID{0};
   std::atomic<bool> _hasAggregator{false};
 
   mutable Mutex _mutex SESSION_LOCK{LockRank::session};
+  std::shared_ptr<Connection> _connection GUARDED_BY(_mutex);
   SharedDictionary _sessionInfo GUARDED_BY(_mutex);
   SharedDictionary _userInfo GUARDED_BY(_mutex);
   std::shared_ptr<const BackendSet> _backends GUARDED_BY(_mutex);

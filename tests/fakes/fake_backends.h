@@ -29,6 +29,8 @@ class FakeBackend final : public VeltraBackend {
   void updateState() override {
     ++updates;
     setState(nextState);
+    setHierarchy(profile().int32("hierarchy").value_or(0));
+    setSamplingThreshold(profile().real("threshold"));
   }
   using VeltraBackend::sendMessage;
   std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue, std::uint16_t method,

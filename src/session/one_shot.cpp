@@ -1,0 +1,41 @@
+// One-shot messages.
+#include "session/one_shot.h"
+
+#include "platform/clock.h"
+#include "platform/log.h"
+#include "protocol/constants.h"
+#include "support/device_identity.h"
+#include "support/message_log.h"
+
+namespace veltrad {
+
+void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& messageLog,
+                                const OneShotMessage& message) {
+  const std::int32_t number =
+      message.sessionInfo ? message.sessionInfo->int32(kVeltraSessionInfoSessionID).value_or(0) : 0;
+  logDebug("sendMessageWithSessionInfo: Sending single message with sessionID %ld",
+           static_cast<long>(number));
+  if (!message.sessionInfo || !message.storebag) {
+    logError("RsendMessageWithSessionInfo: Attempted to send message with one or more nil parameters");
+    return;
+  }
+  char deviceID[41] = {};
+  making.device.copyUniqueDeviceID(deviceID, sizeof deviceID);
+  const auto set = createBackends(making, message.storebag, message.sessionInfo, message.userInfo, deviceID);
+  if (!set) {
+    logError("sendMessageWithSessionInfo: No backends available to send single message");
+    return;
+  }
+  if (message.userInfo && !message.sessionInfo->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false)) {
+    logWarning("sendMessageWithSessionInfo: user info provided without requiring it.");
+  }
+  const platform::TimeValue time = making.clock.now();
+  for (const auto& [name, backend] : *set) {
+    backend->updateState();
+    const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", {name, *answer});
+  }
+  for (const auto& [name, backend] : *set) backend->cleanup();
+}
+
+}  // namespace veltrad
