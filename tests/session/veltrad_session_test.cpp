@@ -268,9 +268,9 @@ TEST_F(Session, TheEndSendsTheStopMessageAndCleansUp) {
 TEST_F(Session, AOneShotMessageLeavesTheSessionsBackendsAlone) {
   const auto oneShot = [this](OptionalDictionary info) {
     std::optional<std::string> given = "(no reply)";
-    session->sendMessageWithSessionInfo(std::move(info), Dictionary{{"clientName", "phone"}}, 5, 1,
-                                        Dictionary{{"n", 1}},
-                                        [&given](auto text) { given = std::move(text); });
+    session->sendMessageWithSessionInfo(
+        std::move(info), Dictionary{{"clientName", "phone"}, {"serviceName", "ringer"}}, 5, 1,
+        Dictionary{{"n", 1}}, [&given](auto text) { given = std::move(text); });
     return given;
   };
   const Dictionary info{{"clientType", 7}, {"sessionID", 9}, {"requireUserInfo", true}};
