@@ -15,6 +15,7 @@
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
 #include "platform/file_store.h"
+#include "storebag/lint.h"
 #include "storebag/signing.h"
 
 namespace veltrad::storebag {
@@ -83,6 +84,24 @@ std::string bounds() {
                      kStorebagBagLimits.depth, kStorebagBagLimits.objects);
 }
 
+// The storebag in a container, unverified, or a bare one.
+Result<Dictionary, std::string> readStorebag(const std::string& file) {
+  const auto bag = readBag(file);
+  if (!bag) return Failure{bag.error()};
+  const Dictionary* content = bag.value().content.asDictionary();
+  if (content == nullptr) return Failure{file + ": no dictionary at its top level"};
+  // A storebag's own entries are dictionaries, its version and its refresh cycle: "bag" as a text is a
+  // container's.
+  const std::string* text = content->string("bag");
+  if (text == nullptr) return *content;
+  const auto decoded = decodeStorebagContainer({std::string(), *text});
+  if (!decoded) return Failure{file + ": \"bag\" is no base64"};
+  const auto inner = parseStorebagBag(decoded->bag);
+  if (!inner)
+    return Failure{fmt::format("{}: the bag is no property list of a dictionary within {}", file, bounds())};
+  return *inner;
+}
+
 }  // namespace
 
 Outcome keygen(const std::string& directory, int bits) {
@@ -147,25 +166,19 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
 }
 
 Outcome show(const std::string& file, bool compact) {
-  const auto bag = readBag(file);
-  if (!bag) return refused(bag.error());
-  const Dictionary* content = bag.value().content.asDictionary();
-  if (content == nullptr) return refused(file + ": no dictionary at its top level");
-  Dictionary storebag = *content;
-  // A storebag's own entries are dictionaries, its version and its refresh cycle: "bag" as a text is a
-  // container's.
-  if (const std::string* text = content->string("bag")) {
-    const auto decoded = decodeStorebagContainer({std::string(), *text});
-    if (!decoded) return refused(file + ": \"bag\" is no base64");
-    const auto inner = parseStorebagBag(decoded->bag);
-    if (!inner)
-      return refused(
-          fmt::format("{}: the bag is no property list of a dictionary within {}", file, bounds()));
-    storebag = *inner;
-  }
-  std::string json = writeJSON(storebag, compact ? JSONStyle::compact : JSONStyle::pretty);
+  const auto storebag = readStorebag(file);
+  if (!storebag) return refused(storebag.error());
+  std::string json = writeJSON(storebag.value(), compact ? JSONStyle::compact : JSONStyle::pretty);
   if (!json.ends_with('\n')) json += '\n';
   return done(std::move(json));
+}
+
+Outcome lint(const std::string& file) {
+  const auto storebag = readStorebag(file);
+  if (!storebag) return refused(storebag.error());
+  std::string text;
+  for (const std::string& finding : lintStorebag(storebag.value())) text += finding + "\n";
+  return text.empty() ? done("nothing found\n") : Outcome{true, std::move(text), true};
 }
 
 }  // namespace veltrad::storebag

@@ -9,6 +9,7 @@ namespace veltrad::storebag {
 struct Outcome {
   bool done = false;
   std::string text;
+  bool findings = false;  // done, but the text says what is wrong with what it was given
 };
 
 // The files that keygen makes in its directory.
@@ -24,5 +25,7 @@ Outcome sign(const std::string& privateKey, const std::string& in, const std::st
 Outcome verify(const std::string& publicKey, const std::string& file);
 // A container's storebag, unverified, or a bare storebag, as JSON.
 Outcome show(const std::string& file, bool compact);
+// What the storebag in such a file would do wrong, a line each, or "nothing found".
+Outcome lint(const std::string& file);
 
 }  // namespace veltrad::storebag

@@ -1,5 +1,6 @@
-// veltra-storebag: makes keys, signs storebags, verifies and shows them. One thread. Exit status: 0 done, 1
-// refused or failed, 2 wrong usage; results on standard output, everything else on standard error.
+// veltra-storebag: makes keys, signs storebags, verifies, shows and looks through them. One thread. Exit
+// status: 0 done, 1 refused, failed or with findings, 2 wrong usage; results on standard output, everything
+// else on standard error.
 #include <CLI/CLI.hpp>
 #include <cstdio>
 #include <exception>
@@ -45,13 +46,17 @@ void describe(CLI::App& app, Arguments& given) {
   show->add_option("FILE", given.file, "A container, or a bare storebag")->required();
   show->add_flag("--json", given.json, "In one line");
   show->callback([&given] { given.outcome = veltrad::storebag::show(given.file, given.json); });
+
+  CLI::App* lint = app.add_subcommand("lint", "Say what a storebag would do wrong, without verifying it");
+  lint->add_option("FILE", given.file, "A container, or a bare storebag")->required();
+  lint->callback([&given] { given.outcome = veltrad::storebag::lint(given.file); });
 }
 
 }  // namespace
 
 int main(int count, char** arguments) {
   try {
-    CLI::App app("Makes, signs, verifies and shows storebags.", "veltra-storebag");
+    CLI::App app("Makes, signs, verifies, shows and looks through storebags.", "veltra-storebag");
     Arguments given;
     describe(app, given);
     try {
@@ -65,7 +70,7 @@ int main(int count, char** arguments) {
     const bool written =
         std::fwrite(text.data(), 1, text.size(), stream) == text.size() && std::fflush(stream) == 0;
     if (!written && given.outcome.done) std::perror("veltra-storebag: standard output");
-    return given.outcome.done && written ? 0 : 1;
+    return given.outcome.done && written && !given.outcome.findings ? 0 : 1;
   } catch (const std::exception& error) {
     std::fprintf(stderr, "veltra-storebag: %s\n", error.what());
     return 1;
