@@ -5,122 +5,86 @@
 
 #include <thread>
 
-#include "base/property_list.h"
-#include "fakes/fake_device_properties.h"
-#include "fakes/fake_file_store.h"
-#include "fakes/fake_preferences.h"
-#include "log_lines.h"
-#include "support/device_identity.h"
+#include "configuration.h"
 
 namespace veltrad {
 namespace {
 
-constexpr const char* kDeployment = "/etc/veltrad/deployment.plist";
-
-struct Machine {
-  explicit Machine(bool internal) {
+struct Machine : Configuration {
+  Machine(bool internal, const char* key, const std::optional<Value>& preference) {
+    preferences.remove("environmentType");
+    preferences.remove("veltra_storebag_url");
+    if (preference) preferences.set(key, *preference);
     if (internal) properties.set("ReleaseType", "Internal");
   }
-  fakes::FakeDeviceProperties properties;
-  DeviceIdentity device{properties};
-  fakes::FakePreferences preferences;
-  fakes::FakeFileStore files;
-  ProcessSettings settings{preferences, device, files, kDeployment};
 };
 
 TEST(ProcessSettings, EnvironmentComesFromThePreferenceOrTheBuild) {
-  struct Case {
+  const struct {
     std::optional<Value> preference;
     bool internal;
     std::uint32_t environment;
     std::string invalid;  // as logged
-  };
-  const std::vector<Case> table = {
-      {std::nullopt, true, 2, ""},   {std::nullopt, false, 3, ""}, {Value(0), false, 0, ""},
-      {Value(1), true, 1, ""},       {Value(4), true, 4, ""},      {Value(4.9), true, 4, ""},
-      {Value(true), false, 1, ""},   {Value(5), false, 2, "5"},    {Value(-1), false, 2, "4294967295"},
-      {Value("4"), false, 3, ""},  // a text is no number, so as if it were absent
-      {Value(Array{}), true, 2, ""},
+  } table[] = {
+      {std::nullopt, true, 2, ""}, {std::nullopt, false, 3, ""},
+      {0, false, 0, ""},           {1, true, 1, ""},
+      {4.9, true, 4, ""},          {true, false, 1, ""},
+      {5, false, 2, "5"},          {-1, false, 2, "4294967295"},
+      {"4", false, 3, ""},  // a text is no number, so as if it were absent
   };
   LogLines log;
-  for (const Case& c : table) {
-    Machine machine(c.internal);
-    if (c.preference) machine.preferences.set("environmentType", *c.preference);
+  for (const auto& c : table) {
+    Machine machine(c.internal, "environmentType", c.preference);
+    std::vector<std::thread> first;
+    for (int i = 0; i < 4; ++i)
+      first.emplace_back([&] { EXPECT_EQ(machine.settings.currentEnvironment(), c.environment); });
+    for (std::thread& thread : first) thread.join();
+    machine.preferences.set("environmentType", 3);
     EXPECT_EQ(machine.settings.currentEnvironment(), c.environment);
     Lines expected;
     if (!c.invalid.empty())
-      expected.push_back("error: userDefaultsEnvironment: Invalid environment type " + c.invalid);
-    expected.push_back("info: userDefaultsEnvironment: Environment type " + std::to_string(c.environment));
+      expected.push_back("3 userDefaultsEnvironment: Invalid environment type " + c.invalid);
+    expected.push_back("6 userDefaultsEnvironment: Environment type " + std::to_string(c.environment));
     EXPECT_EQ(log.take(), expected);
   }
 }
 
 TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
+  const std::string path = platform::Root("/").deploymentPath();
   const std::string hosts = writeXMLPropertyList(
       Dictionary{{"internalStorebagHost", "in.test:8443"}, {"publicStorebagHost", "out.test"}});
   const std::string badHost = writeXMLPropertyList(Dictionary{{"publicStorebagHost", "out.test/elsewhere"}});
-  struct Case {
+  const std::string publicURL = "https://storebags.example/bags/maple",
+                    builtIn = "; using the built-in hosts";
+  const std::string notHost =
+      ": publicStorebagHost is \"out.test/elsewhere\", expected a host name; using storebags.example";
+  const std::string array = writeXMLPropertyList(Array{}), unreadable = "(unreadable)";
+  const struct {
     std::optional<Value> preference;
-    std::optional<std::optional<std::string>> deployment;  // absent; there but unreadable; its content
+    std::optional<std::string> deployment;
     bool internal;
     std::string url;
-    Lines lines;
-  };
-  const std::string path = kDeployment;
-  const std::vector<Case> table = {
-      {std::nullopt, std::nullopt, true, "https://storebags.internal.example/storebags/maple", {}},
-      {std::nullopt, std::nullopt, false, "https://storebags.example/bags/maple", {}},
-      {std::nullopt, hosts, true, "https://in.test:8443/storebags/maple", {}},
-      {std::nullopt, hosts, false, "https://out.test/bags/maple", {}},
-      {Value("https://lab.test/x"), hosts, true, "https://lab.test/x", {}},
-      {Value("https://lab.test/x"), std::optional<std::string>(), false, "https://lab.test/x", {}},
-      {Value(Array{}), hosts, false, "https://out.test/bags/maple", {}},
-      {std::nullopt,
-       std::optional<std::string>(),
-       false,
-       "https://storebags.example/bags/maple",
-       {"warning: storebagServerURL: " + path + ": Permission denied; using the built-in hosts"}},
-      {std::nullopt,
-       writeXMLPropertyList(Array{}),
-       false,
-       "https://storebags.example/bags/maple",
-       {"warning: storebagServerURL: " + path + ": not a dictionary; using the built-in hosts"}},
-      {std::nullopt,
-       badHost,
-       false,
-       "https://storebags.example/bags/maple",
-       {"warning: storebagServerURL: " + path +
-        ": publicStorebagHost is \"out.test/elsewhere\", expected a host name; using storebags.example"}},
+    std::string warning;
+  } table[] = {
+      {std::nullopt, std::nullopt, true, "https://storebags.internal.example/storebags/maple", ""},
+      {std::nullopt, std::nullopt, false, publicURL, ""},
+      {std::nullopt, hosts, true, "https://in.test:8443/storebags/maple", ""},
+      {Array{}, hosts, false, "https://out.test/bags/maple", ""},
+      {"https://lab.test/x", unreadable, true, "https://lab.test/x", ""},
+      {std::nullopt, unreadable, false, publicURL, ": Permission denied" + builtIn},
+      {std::nullopt, array, false, publicURL, ": not a dictionary" + builtIn},
+      {std::nullopt, badHost, false, publicURL, notHost},
   };
   LogLines log;
-  for (const Case& c : table) {
-    Machine machine(c.internal);
-    if (c.preference) machine.preferences.set("veltra_storebag_url", *c.preference);
-    if (c.deployment && *c.deployment) machine.files.put(kDeployment, **c.deployment);
-    if (c.deployment && !*c.deployment)
-      machine.files.failReads(kDeployment, fakes::FakeFileStore::Kind::noAccess);
+  for (const auto& c : table) {
+    Machine machine(c.internal, "veltra_storebag_url", c.preference);
+    if (c.deployment) machine.files.put(path, *c.deployment);
+    if (c.deployment == unreadable) machine.files.failReads(path, fakes::FakeFileStore::Kind::noAccess);
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
-    EXPECT_EQ(log.take(), c.lines);
+    machine.preferences.set("veltra_storebag_url", "https://later.test");
+    EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
+    EXPECT_EQ(log.take(), c.warning.empty() ? Lines{} : Lines{"4 storebagServerURL: " + path + c.warning});
   }
-}
-
-TEST(ProcessSettings, StayWhatTheyWereAtFirstUse) {
-  LogLines log;
-  Machine machine(true);
-  machine.preferences.set("environmentType", 4);
-  machine.preferences.set("veltra_storebag_url", "https://lab.test");
-  std::vector<std::thread> first;
-  for (int i = 0; i < 4; ++i)
-    first.emplace_back([&] {
-      EXPECT_EQ(machine.settings.currentEnvironment(), 4u);
-      EXPECT_EQ(machine.settings.storebagServerURL(), "https://lab.test");
-    });
-  for (std::thread& thread : first) thread.join();
-  machine.preferences.remove("environmentType");
-  machine.preferences.remove("veltra_storebag_url");
-  EXPECT_EQ(machine.settings.currentEnvironment(), 4u);
-  EXPECT_EQ(machine.settings.storebagServerURL(), "https://lab.test");
-  EXPECT_EQ(log.take(), Lines{"info: userDefaultsEnvironment: Environment type 4"});
 }
 
 }  // namespace

@@ -1,7 +1,11 @@
-// An RSA key of the test's own, able to sign as it should be done and in every way that it should not.
+// A key of the test's own, able to sign as it should be done and in every way that it should not.
 #pragma once
 
+#include <gtest/gtest.h>
+#include <openssl/ec.h>
+#include <openssl/encoder.h>
 #include <openssl/evp.h>
+#include <openssl/rsa.h>
 
 #include <memory>
 #include <string>
@@ -9,38 +13,62 @@
 
 namespace veltrad {
 
+inline const unsigned char* in(std::string_view text) {
+  return reinterpret_cast<const unsigned char*>(text.data());
+}
+inline unsigned char* out(std::string& text) {
+  return reinterpret_cast<unsigned char*>(text.data());
+}
+
+inline std::string digestOf(std::string_view bytes, const EVP_MD* algorithm = EVP_sha1()) {
+  std::string digest(static_cast<std::size_t>(EVP_MD_get_size(algorithm)), '\0');
+  EXPECT_EQ(EVP_Digest(bytes.data(), bytes.size(), out(digest), nullptr, algorithm, nullptr), 1);
+  return digest;
+}
+
 class RSAKey {
  public:
-  static RSAKey generate(int bits = 2'048, unsigned exponent = 65'537);
+  explicit RSAKey(EVP_PKEY* key) : _key(key, EVP_PKEY_free) {}
   // One for the whole test program: making a key is slow.
-  static const RSAKey& shared();
+  static const RSAKey& shared() {
+    static const RSAKey key(EVP_RSA_gen(2'048u));
+    return key;
+  }
 
-  std::string sign(std::string_view bytes, const char* digest = "SHA1") const;
-  // The private operation over a block as long as the modulus, without any padding.
-  std::string signBlock(std::string_view block) const;
-  std::size_t bytes() const { return static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())); }
+  std::string sign(std::string_view bytes, const EVP_MD* digest = EVP_sha1()) const {
+    return privateOperation(digestOf(bytes, digest), RSA_PKCS1_PADDING, digest);
+  }
+  // Over a block as long as the modulus, whatever it is padded with.
+  std::string signBlock(std::string_view block) const {
+    return privateOperation(block, RSA_NO_PADDING, nullptr);
+  }
+  std::size_t size() const { return static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())); }
 
-  std::string subjectPublicKeyInfo() const { return encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY); }
-  std::string rsaPublicKey() const { return encoded("type-specific", EVP_PKEY_PUBLIC_KEY); }
-  std::string rsaPrivateKey() const { return encoded("type-specific", EVP_PKEY_KEYPAIR); }
-  std::string privateKeyInfo() const { return encoded("PrivateKeyInfo", EVP_PKEY_KEYPAIR); }
-  std::string publicPEM() const { return encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM"); }
+  std::string encoded(const char* structure = "SubjectPublicKeyInfo", int selection = EVP_PKEY_PUBLIC_KEY,
+                      const char* form = "DER") const {
+    const std::shared_ptr<OSSL_ENCODER_CTX> encoder(
+        OSSL_ENCODER_CTX_new_for_pkey(_key.get(), selection, form, structure, nullptr),
+        OSSL_ENCODER_CTX_free);
+    unsigned char* bytes = nullptr;
+    std::size_t length = 0;
+    EXPECT_EQ(OSSL_ENCODER_to_data(encoder.get(), &bytes, &length), 1) << structure;
+    std::string text(reinterpret_cast<char*>(bytes), length);
+    OPENSSL_free(bytes);
+    return text;
+  }
 
  private:
-  explicit RSAKey(EVP_PKEY* key) : _key(key, EVP_PKEY_free) {}
-  std::string encoded(const char* structure, int selection, const char* form = "DER") const;
+  std::string privateOperation(std::string_view block, int padding, const EVP_MD* digest) const {
+    const std::shared_ptr<EVP_PKEY_CTX> context(EVP_PKEY_CTX_new(_key.get(), nullptr), EVP_PKEY_CTX_free);
+    std::string signature(size(), '\0');
+    std::size_t length = signature.size();
+    EXPECT_TRUE(EVP_PKEY_sign_init(context.get()) == 1 &&
+                EVP_PKEY_CTX_set_rsa_padding(context.get(), padding) == 1 &&
+                (digest == nullptr || EVP_PKEY_CTX_set_signature_md(context.get(), digest) == 1) &&
+                EVP_PKEY_sign(context.get(), out(signature), &length, in(block), block.size()) == 1);
+    return signature;
+  }
   std::shared_ptr<EVP_PKEY> _key;
 };
-
-std::string sha1(std::string_view bytes);
-// SubjectPublicKeyInfo of a public key nobody has the other half of.
-std::string publicKeyOfSize(int bits, unsigned exponent = 65'537);
-// SubjectPublicKeyInfo of a key of another algorithm: "EC", or "RSA-PSS".
-std::string publicKeyOfAlgorithm(const char* algorithm);
-// The smallest number whose cube starts with `block`'s bytes, as a signature of its length: what a forger
-// against exponent 3 sends when `block` ends in bytes that a careless verifier does not look at.
-std::string cubeRootOf(std::string_view block);
-// The cube, in as many bytes.
-std::string cubeOf(std::string_view signature);
 
 }  // namespace veltrad
