@@ -13,13 +13,6 @@ namespace {
 
 using Got = LineReader::Got;
 
-// The signals' mask is a thread's own, so each test runs on one that ends with it.
-template <typename Body>
-void onOwnThread(Body body) {
-  std::thread thread(body);
-  thread.join();
-}
-
 struct Pipe {
   Pipe() {
     int ends[2];
@@ -30,86 +23,55 @@ struct Pipe {
   void write(std::string_view text) {
     ASSERT_EQ(::write(writing.get(), text.data(), text.size()), static_cast<ssize_t>(text.size()));
   }
-  platform::FileDescriptor reading;
-  platform::FileDescriptor writing;
+  platform::FileDescriptor reading, writing;
 };
 
-TEST(LineReader, givesLinesAndTheirNumbers) {
-  onOwnThread([] {
-    Interrupt interrupt;
-    Pipe pipe;
-    LineReader lines(pipe.reading.get(), 8, interrupt);
-    pipe.write("one\n\n12345678\n123456789\nafter\nla");
-    const struct {
-      Got got;
-      const char* line;
-    } expected[] = {{Got::line, "one"},
-                    {Got::line, ""},
-                    {Got::line, "12345678"},
-                    {Got::tooLong, ""},
-                    {Got::line, "after"}};
-    std::uint64_t number = 0;
-    for (const auto& e : expected) {
-      EXPECT_EQ(lines.next(), e.got);
-      EXPECT_EQ(lines.line(), e.line);
-      EXPECT_EQ(lines.number(), ++number);
-    }
-    pipe.write("st");
-    pipe.writing.reset();
-    EXPECT_EQ(lines.next(), Got::line);
-    EXPECT_EQ(lines.line(), "last");
-    EXPECT_EQ(lines.next(), Got::end);
-    EXPECT_EQ(lines.number(), 6u);
-  });
-}
-
-TEST(LineReader, keepsNothingOfALineThatIsFarTooLong) {
-  onOwnThread([] {
-    Interrupt interrupt;
-    Pipe pipe;
-    LineReader lines(pipe.reading.get(), 1000, interrupt);
-    std::thread writer([&pipe] {
-      const std::string block(100'000, 'x');
-      for (int count = 0; count < 20; ++count) pipe.write(block);
-      pipe.write("\nshort\n");
-    });
-    EXPECT_EQ(lines.next(), Got::tooLong);
-    EXPECT_EQ(lines.line(), "");
-    EXPECT_EQ(lines.next(), Got::line);
-    EXPECT_EQ(lines.line(), "short");
-    writer.join();
-  });
+TEST(LineReader, givesLinesAndTheirNumbersAndKeepsNothingOfLongOnes) {
+  Interrupt interrupt;
+  Pipe pipe;
+  LineReader lines(pipe.reading.get(), 8, interrupt);
+  std::thread writer(
+      [&pipe] { pipe.write("one\n\n12345678\n123456789\n" + std::string(500'000, 'x') + "\nafter\nla"); });
+  const std::pair<Got, const char*> expected[] = {{Got::line, "one"},      {Got::line, ""},
+                                                  {Got::line, "12345678"}, {Got::tooLong, ""},
+                                                  {Got::tooLong, ""},      {Got::line, "after"}};
+  std::uint64_t number = 0;
+  for (const auto& [got, line] : expected) {
+    EXPECT_EQ(lines.next(), got);
+    EXPECT_EQ(lines.line(), line);
+    EXPECT_EQ(lines.number(), ++number);
+  }
+  writer.join();
+  pipe.write("st");
+  pipe.writing.reset();
+  EXPECT_EQ(lines.next(), Got::line);
+  EXPECT_EQ(lines.line(), "last");
+  EXPECT_EQ(lines.next(), Got::end);
+  EXPECT_EQ(lines.number(), 7u);
 }
 
 TEST(LineReader, saysThatItCannotRead) {
-  onOwnThread([] {
-    Interrupt interrupt;
-    const platform::FileDescriptor directory(open("/", 0));
-    LineReader lines(directory.get(), 8, interrupt);
-    EXPECT_EQ(lines.next(), Got::failed);
-    EXPECT_EQ(errno, EISDIR);
-  });
+  Interrupt interrupt;
+  const platform::FileDescriptor directory(open("/", 0));
+  LineReader lines(directory.get(), 8, interrupt);
+  EXPECT_EQ(lines.next(), Got::failed);
+  EXPECT_EQ(errno, EISDIR);
 }
 
-TEST(Interrupt, endsAWaitForALine) {
-  onOwnThread([] {
+TEST(Interrupt, endsWaitsAndTimeDoesToo) {
+  // The signals' mask is a thread's own, so it ends with this one.
+  std::thread([] {
     Interrupt interrupt;
     Pipe pipe;
     LineReader lines(pipe.reading.get(), 8, interrupt);
+    const auto before = std::chrono::steady_clock::now();
+    EXPECT_EQ(interrupt.wait(-1, std::chrono::milliseconds(20)), Interrupt::Wake::timeout);
+    EXPECT_GE(std::chrono::steady_clock::now() - before, std::chrono::milliseconds(20));
     interrupt.begin();
     pthread_kill(pthread_self(), SIGINT);
     EXPECT_EQ(lines.next(), Got::interrupted);
     EXPECT_EQ(interrupt.wait(-1, std::chrono::hours(1)), Interrupt::Wake::interrupted);
-  });
-}
-
-TEST(Interrupt, waitsForTheTimeItWasGiven) {
-  onOwnThread([] {
-    Interrupt interrupt;
-    const auto before = std::chrono::steady_clock::now();
-    EXPECT_EQ(interrupt.wait(-1, std::chrono::milliseconds(20)), Interrupt::Wake::timeout);
-    EXPECT_GE(std::chrono::steady_clock::now() - before, std::chrono::milliseconds(20));
-  });
+  }).join();
 }
 
 }  // namespace
