@@ -1,6 +1,7 @@
 """The HTTPS post back end: client entries, filters, batches, collectors with moods, hostile texts, the message log."""
 import collections
 import datetime
+import hashlib
 import itertools
 import json
 import plistlib
@@ -8,10 +9,11 @@ import re
 import shutil
 import time
 
-from harness import Lab, SystemTest, Wire, closed_port, storebag, wait_until
+from harness import DEVICE, Lab, SystemTest, Wire, closed_port, storebag, wait_until
 
 NAMES = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 LOGS = "var/mobile/Library/Logs/Zentrel/Retired"
+COUNTRY = "the country is not in locale_whitelist"
 POST_ERROR = "<3>HTTPSPostBackend(postJsonMessage): post error: "
 
 
@@ -39,9 +41,12 @@ class Client(Wire):
         assert (kind, call) == (self.REPLY, self._call), (kind, call, body)
         return body["results"]
 
-    def ask(self, op, **args):
+    def begin(self, op, **args):
         self._call += 1
         self.send(self.CALL, {"op": op, "args": args}, self._call)
+
+    def ask(self, op, **args):
+        self.begin(op, **args)
         return self.expect()
 
     def start(self):
@@ -93,80 +98,80 @@ class HTTPSTest(SystemTest):
         self.root.preferences = plistlib.loads(path.read_bytes())
         return self.root.preferences
 
+    def stats(self):
+        written = (self.root.path / "run/veltrad/counters.json").exists()
+        return json.loads(self.ctl("stats", "--json")[0])["counts"] if written else {}
+
     def counts(self):
+        """Once the daemon has ended."""
         return json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
 
 
 class Entries(HTTPSTest):
-    OFF = "back end disabled: "
-    # consent, LANG, the entry's changes, reports / held / why it is disabled, the line that says it
-    DECISIONS = [
-        (True, "en_US.UTF-8", {}, "reports", "state=2"),
-        (True, "en_US.UTF-8", {"locale_whitelist": ["DE", "us"]}, "reports", "state=2"),
-        (True, "en_US.UTF-8", {"locale_whitelist": ["DE"]}, "the country is not in locale_whitelist",
-         '(US) isn\'t in country code list ["DE"]'),
-        (True, "en_US.UTF-8", {"locale_whitelist": None}, "the country is not in locale_whitelist",
-         "(US) isn't in country code list (null)"),
-        (True, "en_US.UTF-8", {"device_whitelist": ["Oak", "eL"]}, "reports", "state=2"),
-        (True, "en_US.UTF-8", {"device_whitelist": ["Oak"]}, "the device is not in device_whitelist",
+    # By consent and LANG: the entry's changes, reports / held / why it is disabled, a part of the line that says it.
+    DECISIONS = {(True, "en_US.UTF-8"): [
+        ({}, "reports", "state=2"), ({"locale_whitelist": ["DE", "us"]}, "reports", "state=2"),
+        ({"locale_whitelist": ["DE"]}, COUNTRY, '(US) isn\'t in country code list ["DE"]'),
+        ({"locale_whitelist": None}, COUNTRY, "(US) isn't in country code list (null)"),
+        ({"device_whitelist": ["Oak", "eL"]}, "reports", "state=2"),
+        ({"device_whitelist": ["Oak"]}, "the device is not in device_whitelist",
          '(Elm) isn\'t in device whitelist ["Oak"]'),
-        (True, "en_US.UTF-8", {"device_blacklist": ["ELM4"]}, "the device is in device_blacklist",
+        ({"device_blacklist": ["ELM4"]}, "the device is in device_blacklist",
          '(Elm4,2) is in device blacklist ["ELM4"]'),
-        (True, "en_US.UTF-8", {"filters": None}, "the client entry has no filters", "filters are required."),
-        (True, "en_US.UTF-8", {"sampling_threshold": None}, "the client entry has no sampling threshold", "state=1"),
-        (True, "en_US.UTF-8", {"sampling_threshold": -1}, "held", "state=3"),
-        (True, "en_US.UTF-8", {"sampling_threshold": -1, "override_sampling": 1}, "held", "state=3"),
-        (True, "en_US.UTF-8", {"sampling_threshold": -1, "override_sampling": -1}, "sampled out", "state=1"),
-        (True, "en_US.UTF-8", {"sampling_threshold": -1, "per_country_sampling_thresholds": [
-            {"country": ["us"], "threshold": -2}, {"country": ["DE", "US"], "threshold": 1}]}, "reports",
-         "sampling threshold for US changed from -1.00 to 1.00"),
-        (True, "en_US.UTF-8", {"client": "desk,{NAME}"}, "reports", "state=2"),
-        (True, "en_US.UTF-8", {"client": "desk, {NAME}"}, "no client entry fits", ""),
-        (True, "en_US.UTF-8", {"service": "lamp,{NAME}"}, "reports", "state=2"),
-        (True, "en_US.UTF-8", {"service": "{NAME}x"}, "no client entry fits", ""),
-        (True, "en_US.UTF-8", {"override_dnu": 1}, "reports", "state=2"),
-        (True, "de_CH.UTF-8", {"locale_whitelist": ["CH"], "sampling_threshold": None,
-                               "per_country_sampling_thresholds": [{"country": ["CH"], "threshold": 1}]}, "reports",
-         "sampling threshold for CH changed from 0.00 to 1.00"),
-        (True, "C", {}, "reports", "state=2"),
-        (True, "C", {"locale_whitelist": []}, "the country is not in locale_whitelist", "((null)) isn't in country"),
-        (False, "en_US.UTF-8", {}, "no consent to diagnostic submission", "reporting disabled by DNU: 0."),
-        (False, "en_US.UTF-8", {"override_dnu": 2}, "no consent to diagnostic submission",
-         "reporting disabled by DNU: 2."),
-        (False, "en_US.UTF-8", {"override_dnu": 1}, "reports", "state=2"),
-    ]
+        ({"filters": None}, "the client entry has no filters", "<4>HTTPSPostBackend(updateBackendState): filters are"),
+        ({"sampling_threshold": None}, "the client entry has no sampling threshold", "state=1"),
+        ({"sampling_threshold": -1}, "held", "state=3"),
+        ({"sampling_threshold": -1, "override_sampling": 1}, "held", "state=3"),
+        ({"sampling_threshold": -1, "override_sampling": -1}, "sampled out", "state=1"),
+        ({"sampling_threshold": -1, "per_country_sampling_thresholds": [{"country": ["us"], "threshold": -2}, {
+            "country": ["DE", "US"], "threshold": 1}]}, "reports", "threshold for US changed from -1.00 to 1.00"),
+        ({"client": "desk,{NAME}"}, "reports", "state=2"), ({"client": "desk, {NAME}"}, "no client entry fits", ""),
+        ({"service": "lamp,{NAME}"}, "reports", "state=2"), ({"service": "{NAME}x"}, "no client entry fits", ""),
+        ({"override_dnu": 1}, "reports", "state=2"),
+    ], (True, "de_CH.UTF-8"): [
+        ({"locale_whitelist": ["CH"], "sampling_threshold": None, "per_country_sampling_thresholds": [
+            {"country": ["CH"], "threshold": 1}]}, "reports", "threshold for CH changed from 0.00 to 1.00"),
+    ], (True, "C"): [
+        ({}, "reports", "state=2"),
+        ({"locale_whitelist": []}, COUNTRY, "((null)) isn't in country code list []"),
+    ], (False, "en_US.UTF-8"): [
+        ({}, "no consent to diagnostic submission", "reporting disabled by DNU: 0."),
+        ({"override_dnu": 2}, "no consent to diagnostic submission", "reporting disabled by DNU: 2."),
+        ({"override_dnu": 1}, "reports", "state=2"),
+    ]}
+
+    def decide(self, daemon, name, changes, outcome, line, consent):
+        client = self.client(name)
+        self.assertEqual(client.backends, ["httppost"] if outcome in ("reports", "held") else [])
+        self.assertTrue(any(line in said for said in client.mark(daemon)), line)
+        client.message(9, 9)
+        self.assertEqual(client.flush()[1:], (-1, "Nothing to flush"))
+        client.close()
+        # Start, message, stop; what is held is never posted.
+        expected = 3 if outcome == "reports" else 0
+        posts = self.posts(name, expected)
+        self.assertEqual(len(posts), expected)
+        overridden = changes.get("override_dnu") == 1
+        identifier = self.preferences()["uuidOverrideDNU" if overridden else "uuidRespectDNU"]
+        self.assertEqual({post["body"]["clientId"] for post in posts}, {identifier} if posts else set())
+        self.assertEqual([e["Opt"] for p in posts for e in p["body"]["events"] if e["_status"] == 1],
+                         [(1 + consent) * overridden] if posts else [])
 
     def test_decisions(self):
-        cases = [(f"case{number:03}", *case) for number, case in enumerate(self.DECISIONS)]
-        changed = [{key: value.replace("{NAME}", name) if isinstance(value, str) else value
-                    for key, value in case[2].items()} for name, *case in cases]
-        self.serve(*(entry(name, **changes) for (name, *_), changes in zip(cases, changed)))
-        for consent, lang in dict.fromkeys(case[1:3] for case in cases):
+        names = (f"case{number:03}" for number in itertools.count())
+        cases = [(facts, next(names), *row) for facts, rows in self.DECISIONS.items() for row in rows]
+        self.serve(*(entry(name, **{key: value.replace("{NAME}", name) if isinstance(value, str) else value
+                                    for key, value in changes.items()}) for _, name, changes, *_ in cases))
+        for consent, lang in self.DECISIONS:
             self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
-            reasons = collections.Counter()
+            mine = [case for facts, *case in cases if facts == (consent, lang)]
             with self.serving("filters are required.", env={"LANG": lang}) as daemon:
-                for name, *case, changes, outcome, line in [c for c in cases if c[1:3] == (consent, lang)]:
-                    with self.subTest(changes, consent=consent, lang=lang):
-                        client = self.client(name)
-                        self.assertEqual(client.backends, ["httppost"] if outcome in ("reports", "held") else [])
-                        self.assertTrue(any(line in said for said in client.mark(daemon)), line)
-                        client.message(9, 9)
-                        self.assertEqual(client.flush()[1:], (-1, "Nothing to flush"))
-                        client.close()
-                        # Start, message, stop; what is held is never posted.
-                        posts = self.posts(name, 3 if outcome == "reports" else 0)
-                        self.assertEqual(len(posts), 3 if outcome == "reports" else 0)
-                        overridden = changes.get("override_dnu") == 1
-                        preferences = self.preferences()
-                        for post in posts:
-                            self.assertEqual(post["body"]["clientId"],
-                                             preferences["uuidOverrideDNU" if overridden else "uuidRespectDNU"])
-                        if posts:
-                            stop = next(e for p in posts for e in p["body"]["events"] if e["_status"] == 1)
-                            self.assertEqual(stop["Opt"], (1 + consent) * overridden)
-                        reasons[self.OFF + outcome] += outcome not in ("reports", "held")
-            counted = {key: n for key, n in self.counts().items() if key.startswith(self.OFF)}
-            self.assertEqual(counted, dict(+reasons))
+                for case in mine:
+                    with self.subTest(case, consent=consent, lang=lang):
+                        self.decide(daemon, *case, consent)
+            reasons = collections.Counter("back end disabled: " + case[2] for case in mine
+                                          if case[2] not in ("reports", "held"))
+            self.assertEqual({key: n for key, n in self.counts().items() if "disabled: " in key}, reasons)
 
     def test_custom_identifier_outlives_the_daemon(self):
         name = 'phone "x"\n\0'
@@ -178,7 +183,8 @@ class Entries(HTTPSTest):
         identifier, = {post["body"]["clientId"] for post in self.posts("phone", 4)}
         self.assertEqual(self.preferences()[f"uuid:{name}:ringer"], identifier)
 
-    # Every documented key: values of a wrong type, and what the entry holds besides.
+    # Every documented key: values of a wrong type, and what the entry holds besides. Found by the service where the
+    # test is about the client's name.
     NO_TEXT = (7, True, ["x"], {"x": "y"}, b"x", datetime.datetime(2020, 1, 1))
     NO_NUMBER = ("1", [1], {"x": 1}, b"1", datetime.datetime(2020, 1, 1))
     NO_ARRAY = ("US", 1, {"US": 1}, b"US", [7, True, {"US": "US"}, [["US"]], b"US"])
@@ -208,26 +214,23 @@ class Entries(HTTPSTest):
         event = json.loads(reply)["events"][-1] if reply else {}
         changing = {"_clientTS", "eventTime", "_startTS", "_sessionID", "clientName", "serviceName"}
         said = [re.sub(r"samplingFactor=[\d.]+| list .*|case\d+|session \d+", "", line)
-                for line in client.mark(daemon) if "Backend" in line and not line.startswith("<6>")]
+                for line in client.mark(daemon) if "Backend" in line]
         return client.backends, {key: event[key] for key in event.keys() - changing}, said
 
     def test_wrong_types_are_as_if_absent(self):
-        pairs = [({**more, key: None}, {**more, key: value}) for key, values, more in self.WRONG for value in values]
-        pairs += [({outer: [around]}, {outer: [{**around, key: value}]})
-                  for outer, around, key, values in self.WRONG_INSIDE for value in values]
+        groups = [({**more, key: None}, [{**more, key: value} for value in values]) for key, values, more in self.WRONG]
+        groups += [({outer: [around]}, [{outer: [{**around, key: value}]} for value in values])
+                   for outer, around, key, values in self.WRONG_INSIDE]
         names = (f"case{number:03}" for number in itertools.count())
-        entries, cases = [], []
-        for pair in pairs:
-            cases.append((pair[1], next(names), next(names)))
-            for name, changes in zip(cases[-1][1:], pair):
-                # Found by the service where the test is about the client's name.
-                own = {"service": name} if "client" in changes else {}
-                entries.append(entry(name, **{**own, **changes}))
-        self.serve(*entries)
+        named = [(next(names), absent, [(next(names), wrong) for wrong in wrongs]) for absent, wrongs in groups]
+        self.serve(*(entry(name, **{**({"service": name} if "client" in changes else {}), **changes})
+                     for first, absent, wrongs in named for name, changes in [(first, absent), *wrongs]))
         with self.serving("filters are required.") as daemon:
-            for changes, absent, wrong in cases:
-                with self.subTest(changes):
-                    self.assertEqual(self.outcome(daemon, wrong), self.outcome(daemon, absent))
+            for first, absent, wrongs in named:
+                expected = self.outcome(daemon, first)
+                for name, wrong in wrongs:
+                    with self.subTest(wrong, absent=absent):
+                        self.assertEqual(self.outcome(daemon, name), expected)
 
     def test_wrong_sections(self):
         for client_type, name, section, backends in (
@@ -235,13 +238,14 @@ class Entries(HTTPSTest):
                 (8, "brevatto", {"clients": [7, "phone", [], entry()], "display_url": 7}, ["httppost"]),
                 (9, "sollwick", {"clients": []}, [])):
             self.lab.put(name, storebag(backends={"httppost": section}))
-            with self.subTest(section), self.serving("can't find the client list.", "Backend") as daemon:
+            with self.subTest(section), self.serving("can't find the client list."):
                 client = self.client(client_type=client_type)
                 self.assertEqual(client.backends, backends)
                 self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "URL not available")
 
     def test_thousand_entries_and_filters(self):
-        filters = [{"key": f"field{n}", "action": ("remove", "sha256", "keep")[n % 3], "method": 5} for n in range(1000)]
+        actions = ("remove", "sha256", "keep")
+        filters = [{"key": f"field{n}", "action": actions[n % 3], "method": 5} for n in range(1000)]
         self.serve(*(entry(f"client{n:03}") for n in range(999)), entry("phone", filters=filters))
         with self.serving():
             begin = time.monotonic()
@@ -251,3 +255,212 @@ class Entries(HTTPSTest):
         kept = {key: value for key, value in event.items() if key.startswith("field")}
         self.assertEqual({key: len(value) for key, value in kept.items()},
                          {f"field{n}": 64 if n % 3 == 1 else 1 for n in range(0, 1000, 10) if n % 3})
+
+
+class Events(HTTPSTest):
+    def test_batches_thresholds_and_order(self):
+        self.serve(entry(event_threshold=2, realtime_post_url="${url}/events/urgent"), entry("slow", expedite=0),
+                   entry("fast", expedite=1))
+        with self.serving() as daemon:
+            client = self.client(batchEvent=True)
+            self.assertEqual([client.message(number=n) for n in range(3)], [None] * 3)
+            self.assertEqual([e.get("number") for e in json.loads(client.message(number=3))["events"]], [None, 0, 1, 2])
+            daemon.wait_for_line("Flushing all batched events as we reached event threshold for method 5")
+            flushed, alone = client.message(flag=1, number=4).removeprefix("Flushed events:\n").split(
+                "\nStandalone event:\n")
+            self.assertEqual([e["number"] for text in (flushed, alone) for e in json.loads(text)["events"]], [3, 4])
+            self.assertEqual(client.flush(), (None, -1, "Nothing to flush"))
+            client.message(number=5)
+            reply, *error = client.flush()
+            self.assertEqual(([e["number"] for e in json.loads(reply)["events"]], error), ([5], [None, None]))
+            slow, fast = self.client("slow"), self.client("fast", batchEvent=True)
+            self.assertEqual((slow.message(), fast.event()["_eventNumber"]), (None, 2))
+            for each in (client, slow, fast):
+                each.close()
+            sizes = {name: sorted(len(post["body"]["events"]) for post in self.posts(name, count))
+                     for name, count in (("phone", 4), ("urgent", 1), ("slow", 1), ("fast", 3))}
+        self.assertEqual(sizes, {"phone": [1, 1, 1, 4], "urgent": [1], "slow": [3], "fast": [1, 1, 1]})
+        self.assertEqual([{post["headers"].get("X-VLT-Event-Map") for post in self.posts(name)}
+                          for name in ("phone", "slow", "urgent")], [{None}, {None}, {"5 2"}])
+        self.assertEqual(self.counts()["event posted"], 14)
+
+    def test_held_by_sampling_until_the_flag(self):
+        self.serve(entry(sampling_threshold=-1, override_sampling=0.5))
+        with self.serving():
+            silent, heard = self.client(batchEvent=True), self.client()
+            for client in (silent, heard):
+                self.assertEqual((client.backends, client.message(number=1)), (["httppost"], None))
+            self.assertEqual(heard.event(flag=2, number=2)["number"], 2)
+            self.assertEqual([e.get("number") for e in json.loads(heard.flush()[0])["events"]], [None, 1])
+            silent.close()
+            heard.close()
+            self.posts("phone", 3)
+        events = self.lab.events()
+        self.assertEqual(len(events), 4)
+        stop = next(e for e in events if (e["_method"], e["_status"]) == (0, 1))
+        expected = {"Opt": 0, "SamplingThreshold": -1, "OverrideSampling": 0.5, "Batch": 0, "StorebagVersion": "v1"}
+        self.assertEqual({key: stop[key] for key in expected}, expected)
+        self.assertEqual(self.counts()["event dropped: flushed while the back end does not report"], 3)
+
+    def test_filters(self):
+        self.serve(entry(filters=[
+            {"key": "PEER", "action": "remove"}, {"key": "line", "status": 3, "action": "keep"},
+            {"key": "line", "action": "sha256"}, {"key": "codec", "method": 6, "action": "sha256"},
+            {"key": "number", "action": "sha256"}, {"key": "list", "action": "sha256"},
+            {"key": "kept", "action": "Remove"}]))
+        payload = {"peer": "secret", "line": "secret", "codec": "opus", "number": 1, "list": ["secret"], "kept": 1}
+        secret, opus, one = (hashlib.sha256(text).hexdigest() for text in (b"secret", b"opus", b"1"))
+        with self.serving():
+            client = self.client(batchEvent=True, user_info={"line": "secret", "peer": "secret"})
+            for category, type in ((5, 2), (5, 3), (6, 2)):
+                client.message(category, type, **payload)
+            client.flush()
+            post, = self.posts("phone", 1)
+            client.close()
+        seen = [[event.get(key) for key in payload] for event in post["body"]["events"][1:]]
+        # The user info is filtered once more for the flush, as method 0 and status 0.
+        self.assertEqual(seen, [[None, secret, "opus", one, None, 1], [None, secret, "opus", one, None, 1],
+                                [None, secret, opus, one, None, 1]])
+        self.assertNotIn('"secret"', json.dumps(post))
+
+    def test_extras_of_an_internal_build(self):
+        self.root.write("etc/veltrad/device.plist", {**DEVICE, "ReleaseType": "Internal"})
+        self.serve(entry("plain"), entry("extras", extras_on_internal=1, custom_clientId=1))
+        with self.serving():
+            for name, identifier in (("plain", None), ("extras", DEVICE["UniqueDeviceID"])):
+                client = self.client(name)
+                event = client.event()
+                self.assertEqual(event["_sessionID"], client.number)
+                post, *_ = self.posts(name, 2)
+                self.assertEqual(post["headers"]["X-VLT-Internal-Build"], "1")
+                self.assertEqual(post["body"]["clientId"], identifier or self.preferences()["uuidRespectDNU"])
+                client.close()
+
+
+class Hostile(HTTPSTest):
+    TEXTS = ['"quoted\\"', "line\r\nX-Evil: 1\r\n\r\n", "nul\0after", "\u202ereversed\u2066", "\u2028\u2029\x85",
+             "\x1b[31mred\x7f", "ünïcödé 🦉", "x" * (200 << 10), "%s%n%@", ""]
+
+    def test_texts_break_nothing(self):
+        self.serve(entry(client=None, custom_clientId=1))
+        payload = {f"key{n} {text[:30]}": text for n, text in enumerate(self.TEXTS)}
+        payload.update(at=datetime.datetime(2014, 11, 16, 20, 13, 54), list=[["a\nb"]], more={"a\n": "b"}, raw=b"\0")
+        with self.serving("Quillfen unable to handle key: ") as daemon:
+            for name in (text for text in self.TEXTS if len(text) < 1000):
+                client = self.client(name, user_info={"service\nName": name, "serviceName": name[::-1]})
+                event = client.event(**payload)
+                for key, text in payload.items():
+                    if isinstance(text, str):
+                        self.assertEqual(event[key], text, key[:50])
+                self.assertEqual([event[key] for key in ("at", "clientName", "serviceName")],
+                                 [1416168834, name, name[::-1]])
+                self.assertFalse({"list", "more", "raw"} & set(event))
+                client.message(9, 9, **{"list\n<3>faked": [1]})
+                client.close()
+            posts = self.posts("phone", 4 * (len(self.TEXTS) - 1))
+            daemon.wait_for_line("Quillfen unable to handle key: list\\x0A<3>faked, value: [1]", len(self.TEXTS) - 1)
+        allowed = {"Host", "User-Agent", "Accept", "Content-Type", "Content-Length", "Content-Encoding", "X-VLT-Sender",
+                   "X-VLT-Client-Name", "X-VLT-Service-Name", "X-VLT-Client-Version", "X-VLT-Event-Map"}
+        for post in posts:
+            self.assertLessEqual(set(post["headers"]), allowed)
+            name = post["body"]["events"][0]["clientName"]
+            sent = "".join(c for c in name if c >= " " and c != "\x7f").strip(" ")
+            self.assertEqual(post["headers"].get("X-VLT-Client-Name", ""), sent)
+        self.assertEqual(self.counts()["event field removed: JSON cannot carry it"], 4 * (len(self.TEXTS) - 1))
+        self.assertEqual(len({post["body"]["clientId"] for post in posts}), len(self.TEXTS) - 1)
+        for log in (self.root.path / LOGS).iterdir():
+            entries = [line for line in log.read_text().split("\n") if "[httppost -> " in line]
+            self.assertEqual(len(entries), len(posts))
+
+
+class MessageLog(HTTPSTest):
+    def lines(self):
+        """The operation and the category of each entry."""
+        files = list((self.root.path / LOGS).iterdir())
+        self.assertEqual(len(files), 1)
+        self.assertRegex(files[0].name, r"^veltrad_\d+_messageLog\.diag$")
+        date = r"\d{4}-\d\d-\d\d \d\d:\d\d:\d\d \+0000"
+        return re.findall(rf"^\({date}\) \[httppost -> (\w+)\] \{{$", files[0].read_text(), re.M)
+
+    def test_a_line_for_each_answer(self):
+        self.serve(entry())
+        failed = [f"writeToLogFile: {what} " for what in ("Error reading from log directory:", "Failed to create new")]
+        with self.serving(*failed) as daemon:
+            client = self.client(batchEvent=True)
+            client.message()
+            self.assertFalse((self.root.path / LOGS).exists())
+            client.flush()
+            client.message(flag=1)
+            self.assertEqual(self.lines(), ["flushMessages", "sendMessageWithDictionary"])
+            shutil.rmtree(self.root.path / LOGS)
+            (self.root.path / LOGS).write_text("in the way")
+            self.assertEqual(client.event(flag=1)["_method"], 5)
+            for line in failed:
+                daemon.wait_for_line("<3>" + line)
+            (self.root.path / LOGS).unlink()
+            client.message(flag=1)
+            self.assertEqual(self.lines(), ["sendMessageWithDictionary"])
+            client.close()
+            self.posts("phone", 5)
+
+    def test_nothing_without_consent(self):
+        self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+        self.serve(entry(override_dnu=1))
+        with self.serving():
+            client = self.client()
+            self.assertEqual((client.message(), client.flush()), (None, (None, -1, "Nothing to flush")))
+            client.close()
+            self.posts("phone", 3)
+        self.assertFalse((self.root.path / LOGS).exists())
+
+
+class Moods(HTTPSTest):
+    URLS = {"refused": f"https://localhost:{closed_port()}/events", "nowhere": "https://collector.invalid/"}
+    # The collector's mood, the code and text of the error that the flush reports, how many posts arrive.
+    MOODS = [
+        ("well", {}, (None, None), 1), ("missing", {"status": 404}, (None, None), 1),
+        ("redirect", {"status": 302, "headers": {"Location": "/events/elsewhere"}}, (None, None), 1),
+        ("dripping", {"dripMs": 10, "body": "x" * 20}, (None, None), 1), ("stalled", {"stall": True}, (None, None), 1),
+        ("broken", {"status": 503}, (503, "backend httppost disabled by server 503 return code"), 1),
+        # A connection that was kept and ends without a byte may have gone before the post: libcurl sends it once more.
+        ("cut", {"cut": True}, (-1, "Empty reply from server"), 2),
+        ("halfway", {"cutHalfway": True, "body": "xxxx"}, (-1, "transfer closed with 2 bytes remaining to read"), 1),
+        ("endless", {"endless": True}, (-1, "The answer is larger than 16777216 bytes"), 1),
+        ("refused", {}, (-1, "Failed to connect to localhost port "), 0),
+        ("nowhere", {}, (-1, "Could not resolve host: collector.invalid"), 0),
+        ("stranger", {}, (-1, "SSL certificate problem: self-signed certificate"), 0)]
+
+    def flush_in_a_mood(self, daemon, name, rule, expected, arrived):
+        client = self.client(name, batchEvent=True)
+        client.message(number=1)
+        self.lab.control(path="/events/" + name, **rule)
+        client.begin("flushMessagesWithCompletion:")
+        if "stall" in rule:
+            self.posts(name, 1)
+            self.lab.reset()
+        answer = client.expect()
+        error = answer.get("error", {})
+        self.assertEqual(json.loads(answer["reply"])["events"][1]["number"], 1)
+        self.assertEqual((error.get("code"), error.get("description", "")[:len(expected[1] or "")] or None), expected)
+        if error:
+            daemon.wait_for_line((POST_ERROR if expected[0] == -1 else "<6>postJSONMessage: ") + error["description"])
+        self.assertEqual(client.states(clientName=name, serviceName=name), ["httppost"] * (expected[0] != 503))
+        self.assertEqual(client.start(), ["httppost"])
+        self.assertLessEqual(len(self.posts(name, min(arrived, 1))), arrived)
+        self.lab.reset()
+        client.close()
+
+    def test_each_flush_is_answered_once(self):
+        stranger = Lab(own_certificate=True)
+        self.addCleanup(stranger.stop)
+        urls = {**self.URLS, "stranger": stranger.url + "/events"}
+        self.serve(*(entry(name, **({"post_url": urls[name]} if name in urls else {})) for name, *_ in self.MOODS))
+        with self.serving(POST_ERROR) as daemon:
+            for mood in self.MOODS:
+                with self.subTest(mood[0]):
+                    self.flush_in_a_mood(daemon, *mood)
+            # Each mood: start and message; then, in peace where there is a lab, the second start and the stop.
+            counts = {"event posted": 5 * 2 + 9 * 2, "event lost: the server answered 5xx": 2,
+                      "event lost: the post failed": 3 * 2 + 3 * 4, "event held: batched": 12 * 4}
+            wait_until(lambda: counts.items() <= self.stats().items(), counts)
+        self.assertEqual((self.posts("elsewhere"), stranger.received("events")), ([], []))
