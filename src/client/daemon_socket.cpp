@@ -161,8 +161,9 @@ std::optional<ConnectFailure> verdictOnGreeting(const ipc::Frame& frame, const s
 
 }  // namespace
 
-Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls) {
-  const auto deadline = std::chrono::steady_clock::now() + kGreetingTimeout;
+Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
+                                                 std::chrono::milliseconds patience) {
+  const auto deadline = std::chrono::steady_clock::now() + patience;
   auto connected = connectTo(path);
   if (!connected) return Failure{connected.error()};
   DaemonSocket daemon{std::move(connected).value(), {}};
@@ -181,7 +182,7 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
       return Failure{
           noDaemon(fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or "
                                "overloaded.",
-                               shown, kGreetingTimeout.count()))};
+                               shown, std::chrono::duration<double>(patience).count()))};
     case Came::end:
       return Failure{
           noDaemon(fmt::format("The daemon on {} ended the connection without a word: start veltrad "

@@ -26,7 +26,8 @@ struct DaemonSocket {
 };
 
 // Connects to `path`, says hello and sends `firstCalls` (whole frames) behind it, and waits for the daemon's
-// hello.
-Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls);
+// hello, for `patience` at most.
+Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
+                                                 std::chrono::milliseconds patience = kGreetingTimeout);
 
 }  // namespace veltrad

@@ -3,121 +3,99 @@
 
 #include <cmath>
 #include <limits>
-#include <string>
 
-#include "veltra/veltra.h"
+#include "veltra/veltra.hpp"
 
 namespace {
 
+using veltra::Value;
+
 TEST(Values, ReadAsTheirTypeAndAsNothingElse) {
+  constexpr auto kLowest = std::numeric_limits<std::int64_t>::min();
+  constexpr auto kHighest = std::numeric_limits<std::uint64_t>::max();
   struct Case {
-    veltra_value* value;
+    Value value;
     veltra_type type;
-    bool boolean;
-    int64_t asSigned;
-    uint64_t asUnsigned;
-    double real;
-    const char* text;
-    size_t dataLength;
+    std::int64_t asSigned = 0;
+    std::uint64_t asUnsigned = 0;
+    double real = 0;
+    std::optional<std::string_view> string = {};
+    std::optional<std::string_view> data = {};
   };
-  constexpr auto kLowest = std::numeric_limits<int64_t>::min();
-  constexpr auto kHighest = std::numeric_limits<uint64_t>::max();
   const Case cases[] = {
-      {nullptr, VELTRA_TYPE_NONE, false, 0, 0, 0, nullptr, 0},
-      {veltra_boolean(true), VELTRA_TYPE_BOOLEAN, true, 0, 0, 0, nullptr, 0},
-      {veltra_signed(kLowest), VELTRA_TYPE_SIGNED, false, kLowest, 0, -0x1p63, nullptr, 0},
-      {veltra_signed(5), VELTRA_TYPE_SIGNED, false, 5, 5, 5, nullptr, 0},
-      {veltra_unsigned(kHighest), VELTRA_TYPE_UNSIGNED, false, 0, kHighest, 0x1p64, nullptr, 0},
-      {veltra_unsigned(7), VELTRA_TYPE_UNSIGNED, false, 7, 7, 7, nullptr, 0},
-      {veltra_real(-HUGE_VAL), VELTRA_TYPE_REAL, false, 0, 0, -HUGE_VAL, nullptr, 0},
-      {veltra_date(1.5), VELTRA_TYPE_DATE, false, 0, 0, 1.5, nullptr, 0},
-      {veltra_string("a\xC3(\xE2\x82"), VELTRA_TYPE_STRING, false, 0, 0, 0,
-       "a\xEF\xBF\xBD(\xEF\xBF\xBD\xEF\xBF\xBD", 0},
-      {veltra_string(nullptr), VELTRA_TYPE_NONE, false, 0, 0, 0, nullptr, 0},
-      {veltra_data("\0\1\2", 3), VELTRA_TYPE_DATA, false, 0, 0, 0, nullptr, 3},
-      {veltra_array(), VELTRA_TYPE_ARRAY, false, 0, 0, 0, nullptr, 0},
+      {Value{}, VELTRA_TYPE_NONE},
+      {true, VELTRA_TYPE_BOOLEAN},
+      {kLowest, VELTRA_TYPE_SIGNED, kLowest, 0, -0x1p63},
+      {5, VELTRA_TYPE_SIGNED, 5, 5, 5},
+      {kHighest, VELTRA_TYPE_UNSIGNED, 0, kHighest, 0x1p64},
+      {7u, VELTRA_TYPE_UNSIGNED, 7, 7, 7},
+      {-HUGE_VAL, VELTRA_TYPE_REAL, 0, 0, -HUGE_VAL},
+      {veltra::Date{1.5}, VELTRA_TYPE_DATE, 0, 0, 1.5},
+      {"a\xC3(\xE2\x82", VELTRA_TYPE_STRING, 0, 0, 0, "a\xEF\xBF\xBD(\xEF\xBF\xBD\xEF\xBF\xBD"},
+      {std::string("a\0b", 3), VELTRA_TYPE_STRING, 0, 0, 0, std::string_view("a\0b", 3)},
+      {static_cast<const char*>(nullptr), VELTRA_TYPE_NONE},
+      {veltra::Data{{"\0\1\2", 3}}, VELTRA_TYPE_DATA, 0, 0, 0, {}, std::string_view("\0\1\2", 3)},
+      {veltra::Array{}, VELTRA_TYPE_ARRAY},
   };
   for (const Case& each : cases) {
     SCOPED_TRACE(&each - cases);
-    EXPECT_EQ(veltra_type_of(each.value), each.type);
-    EXPECT_EQ(veltra_get_boolean(each.value), each.boolean);
-    EXPECT_EQ(veltra_get_signed(each.value), each.asSigned);
-    EXPECT_EQ(veltra_get_unsigned(each.value), each.asUnsigned);
-    EXPECT_EQ(veltra_get_real(each.value), each.real);
-    EXPECT_STREQ(veltra_get_string(each.value, nullptr), each.text);
-    size_t length = 99;
-    EXPECT_EQ(veltra_get_data(each.value, &length) != nullptr, each.dataLength > 0);
-    EXPECT_EQ(length, each.dataLength);
-    veltra_release(each.value);
+    EXPECT_EQ(each.value.type(), each.type);
+    EXPECT_EQ(each.value.boolean(), each.type == VELTRA_TYPE_BOOLEAN);
+    EXPECT_EQ(each.value.asSigned(), each.asSigned);
+    EXPECT_EQ(each.value.asUnsigned(), each.asUnsigned);
+    EXPECT_EQ(each.value.real(), each.real);
+    EXPECT_EQ(each.value.string(), each.string);
+    EXPECT_EQ(each.value.data(), each.data);
   }
-  veltra_value* nan = veltra_real(std::nan(""));
-  EXPECT_TRUE(std::isnan(veltra_get_real(nan)));
-  veltra_release(nan);
-  veltra_value* text = veltra_string_with_length("a\0b", 3);
-  size_t length = 0;
-  EXPECT_EQ(std::string(veltra_get_string(text, &length), length), std::string("a\0b", 3));
-  veltra_release(text);
 }
 
 TEST(Values, DictionariesKeepTheOrderOfKeysHoweverLargeAndHoweverBuilt) {
   constexpr unsigned kEntries = 60'000;
-  veltra_value* dictionary = veltra_dictionary();
+  veltra::Dictionary dictionary;
   for (unsigned round = 0; round < 2; ++round) {  // the second replaces every value
     for (unsigned i = 0; i < kEntries; ++i) {
       const unsigned key = 100'000 + i * 7'919u % kEntries;
-      ASSERT_EQ(veltra_dictionary_set(dictionary, std::to_string(key).c_str(), veltra_unsigned(key + round)),
-                VELTRA_OK);
+      ASSERT_TRUE(dictionary.set(std::to_string(key).c_str(), key + round));
     }
   }
-  ASSERT_EQ(veltra_count(dictionary), kEntries);
+  ASSERT_EQ(dictionary.count(), kEntries);
   for (unsigned i = 0; i < kEntries; ++i) {
-    const char* key = nullptr;
-    const veltra_value* value = veltra_dictionary_entry(dictionary, i, &key);
-    ASSERT_STREQ(key, std::to_string(100'000 + i).c_str());
-    ASSERT_EQ(veltra_get_unsigned(value), 100'001 + i);
+    const auto [key, value] = dictionary.entry(i);
+    ASSERT_EQ(key, std::to_string(100'000 + i));
+    ASSERT_EQ(value.asUnsigned(), 100'001 + i);
   }
-  const char* key = "left over";
-  EXPECT_EQ(veltra_dictionary_entry(dictionary, kEntries, &key), nullptr);
-  EXPECT_EQ(key, nullptr);
-  EXPECT_EQ(veltra_dictionary_item(dictionary, "none"), nullptr);
-  veltra_dictionary_set(dictionary, "0", veltra_boolean(true));
-  veltra_dictionary_entry(dictionary, 0, &key);
-  EXPECT_STREQ(key, "0");
-  veltra_release(dictionary);
+  EXPECT_FALSE(dictionary.entry(kEntries).second);
+  EXPECT_FALSE(dictionary.item("none"));
+  dictionary.set("0", true);
+  EXPECT_EQ(dictionary.entry(0).first, "0");
 }
 
 // Under AddressSanitizer this also shows that every reference is let go, taken over or not.
 TEST(Values, PartsAreFrozenAndRefusedOnesAreReleased) {
-  veltra_value* array = veltra_array();
-  veltra_value* inner = veltra_dictionary();
-  EXPECT_EQ(veltra_array_append(array, veltra_retain(inner)), VELTRA_OK);
-  EXPECT_EQ(veltra_dictionary_set(inner, "late", veltra_signed(1)), VELTRA_INVALID);
-  EXPECT_EQ(veltra_dictionary_set(inner, "loop", veltra_retain(array)), VELTRA_INVALID);
-  EXPECT_EQ(veltra_array_append(array, veltra_retain(array)), VELTRA_INVALID);
-  EXPECT_EQ(veltra_array_append(array, veltra_retain(inner)), VELTRA_OK);
-  EXPECT_EQ(veltra_dictionary_set(array, "k", veltra_signed(1)), VELTRA_INVALID);
+  veltra::Array array;
+  veltra::Dictionary inner;
+  EXPECT_TRUE(array.append(inner));
+  EXPECT_FALSE(inner.set("late", 1));
+  EXPECT_FALSE(inner.set("loop", array));
+  EXPECT_FALSE(array.append(array));
+  EXPECT_TRUE(array.append(inner));
+  EXPECT_FALSE(array.append({}));
+  EXPECT_FALSE(veltra::Dictionary{}.set(nullptr, 1));
+  EXPECT_EQ(veltra_dictionary_set(const_cast<veltra_value*>(array.get()), "k", veltra_signed(1)),
+            VELTRA_INVALID);
   EXPECT_EQ(veltra_array_append(nullptr, veltra_signed(1)), VELTRA_INVALID);
-  EXPECT_EQ(veltra_array_append(array, nullptr), VELTRA_INVALID);
-  veltra_value* dictionary = veltra_dictionary();
-  EXPECT_EQ(veltra_dictionary_set(dictionary, nullptr, veltra_signed(1)), VELTRA_INVALID);
-  EXPECT_EQ(veltra_count(dictionary), 0u);
-  veltra_release(dictionary);
-  EXPECT_EQ(veltra_count(array), 2u);
-  EXPECT_EQ(veltra_array_item(array, 1), inner);
-  EXPECT_EQ(veltra_array_item(array, 2), nullptr);
-  veltra_release(array);
-  EXPECT_EQ(veltra_count(inner), 0u);
-  veltra_release(inner);
+  EXPECT_EQ(array.count(), 2u);
+  EXPECT_EQ(array.item(1).get(), inner.get());
+  EXPECT_FALSE(array.item(2));
+  EXPECT_EQ(inner.count(), 0u);
 
-  veltra_value* deep = veltra_array();
+  Value deep = veltra::Array{};
   for (int depth = 1; depth < 64; ++depth) {
-    veltra_value* outer = veltra_array();
-    ASSERT_EQ(veltra_array_append(outer, deep), VELTRA_OK) << depth;
+    veltra::Array outer;
+    ASSERT_TRUE(outer.append(deep)) << depth;
     deep = outer;
   }
-  veltra_value* tooDeep = veltra_array();
-  EXPECT_EQ(veltra_array_append(tooDeep, deep), VELTRA_INVALID);
-  veltra_release(tooDeep);
+  EXPECT_FALSE(veltra::Array{}.append(deep));
 }
 
 }  // namespace
