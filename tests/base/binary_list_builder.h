@@ -42,6 +42,11 @@ inline std::string binaryList(const std::vector<std::string>& objects) {
   return binaryList(objects, [](Trailer&) {});
 }
 
+// A text of up to 14 ASCII characters.
+inline std::string ascii(const std::string& text) {
+  return static_cast<char>(0x50 | text.size()) + text;
+}
+
 // A marker with its count, then references of two bytes.
 inline std::string container(unsigned type, std::uint64_t count,
                              const std::vector<std::uint64_t>& references) {

@@ -21,6 +21,9 @@ void* operator new(std::size_t size) {
   mostBytes = std::max(mostBytes, heldBytes);
   return block;
 }
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept {
+  return operator new(size);
+}
 void operator delete(void* block) noexcept {
   heldBytes -= malloc_usable_size(block);
   std::free(block);
@@ -89,12 +92,6 @@ std::string shared(const std::string& object, std::size_t times) {
   return binaryList({container(0xA0, times, std::vector<std::uint64_t>(times, 1)), object});
 }
 
-std::string manyAttributes() {
-  std::string tag = "<plist";
-  for (int i = 0; tag.size() < 1'000'000; ++i) tag += " a" + std::to_string(i) + "=\"\"";
-  return tag + "><true/></plist>";
-}
-
 struct Hostile {
   const char* name;
   std::string bytes;
@@ -103,34 +100,36 @@ struct Hostile {
 
 std::vector<Hostile> hostileLists() {
   const std::string plist = "<plist version=\"1.0\">";
+  std::string manyAttributes = "<plist";
+  for (int i = 0; manyAttributes.size() < 1'000'000; ++i)
+    manyAttributes += " a" + std::to_string(i) + "=\"\"";
   return {
-      {"billionLaughsOfArrays", laughs(0xA0, 30, 1000, "\x09"), Kind::tooLarge},
-      {"billionLaughsOfDictionaries", laughs(0xD0, 30, 10, "\x09"), Kind::tooLarge},
-      {"doublingText", laughs(0xA0, 20, 2, "\x5F\x12" + bigEndian(500'000, 4) + std::string(500'000, 'x')),
+      {"arrays laugh", laughs(0xA0, 30, 1000, "\x09"), Kind::tooLarge},
+      {"dictionaries laugh", laughs(0xD0, 30, 10, "\x09"), Kind::tooLarge},
+      {"a text doubles", laughs(0xA0, 20, 2, "\x5F\x12" + bigEndian(500'000, 4) + std::string(500'000, 'x')),
        Kind::tooLarge},
-      {"sharedData", shared("\x4F\x10\x58" + std::string(0x58, 'x'), 65'535), std::nullopt},
-      {"sharedArray", shared("\xA0", 65'535), std::nullopt},
-      {"sharedLongCharacters",
+      {"shared data", shared("\x4F\x10\x58" + std::string(0x58, 'x'), 65'535), {}},
+      {"a shared array", shared("\xA0", 65'535), {}},
+      {"shared long characters",
        shared("\x6F\x12" + bigEndian(200'000, 4) + repeated("\x26\x03", 200'000), 65'535), Kind::tooLarge},
-      {"cycleAtTheEnd",
+      {"a cycle at the end",
        binaryList({container(0xA0, 60'000, std::vector<std::uint64_t>(60'000, 1)), container(0xA0, 1, {0})}),
        Kind::cyclic},
-      {"deepArrays", nested(60'000), Kind::tooDeep},
-      {"hugeCount", binaryList({container(0xD0, 1ull << 40, {1, 1})}), Kind::malformed},
-      {"deepXML", plist + repeated("<array>", 100'000), Kind::tooDeep},
-      {"entityBomb",
+      {"deep arrays", nested(60'000), Kind::tooDeep},
+      {"a huge count", binaryList({container(0xD0, 1ull << 40, {1, 1})}), Kind::malformed},
+      {"deep XML", plist + repeated("<array>", 100'000), Kind::tooDeep},
+      {"entities",
        "<!DOCTYPE plist [<!ENTITY a \"ha\"><!ENTITY b \"&a;&a;\">]>" + plist + "<string>&b;</string></plist>",
        Kind::forbidden},
-      {"manyAttributes", manyAttributes(), Kind::tooLarge},
-      {"manyElements", plist + "<array>" + repeated("<true/>", 100'000) + "</array></plist>", Kind::tooLarge},
-      {"manyDictionaries",
+      {"attributes", manyAttributes + "><true/></plist>", Kind::tooLarge},
+      {"elements", plist + "<array>" + repeated("<true/>", 100'000) + "</array></plist>", Kind::tooLarge},
+      {"dictionaries",
        plist + "<array>" + repeated("<dict><key>k</key><data>AAAA</data></dict>", 20'000) +
            "</array></plist>",
-       std::nullopt},
-      {"manyLines", plist + "<string>" + repeated("&lt;\n", 200'000) + "</string></plist>", std::nullopt},
-      {"longDoctype", "<!DOCTYPE " + std::string(1'000'000, 'a') + ">", Kind::malformed},
-      {"longComment", "<!--" + std::string(1'000'000, '-'), Kind::malformed},
-  };
+       {}},
+      {"lines", plist + "<string>" + repeated("&lt;\n", 200'000) + "</string></plist>", {}},
+      {"a long doctype", "<!DOCTYPE " + std::string(1'000'000, 'a') + ">", Kind::malformed},
+      {"a long comment", "<!--" + std::string(1'000'000, '-'), Kind::malformed}};
 }
 
 TEST(HostilePropertyList, endsInTimeAndMemory) {

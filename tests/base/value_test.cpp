@@ -9,29 +9,27 @@ namespace veltrad {
 namespace {
 
 TEST(Value, readsNumbersByOneRule) {
-  struct Case {
+  const struct {
     Value value;
     std::optional<bool> boolean;
     std::optional<std::int32_t> int32;
     std::optional<std::uint16_t> uint16;
     std::optional<double> real;
     std::optional<std::string> text;
-  } const kCases[] = {
-      {true, true, 1, 1, 1.0, "1"},
-      {0, false, 0, 0, 0.0, "0"},
-      {-1, true, -1, 65535, -1.0, "-1"},
-      {4294967297, true, 1, 1, 4294967297.0, "4294967297"},
-      {UINT64_MAX, true, -1, 65535, 18446744073709551616.0, "18446744073709551615"},
-      {-1.9, true, -1, 65535, -1.9, "-1.9"},
-      {65537.5, true, 65537, 1, 65537.5, "65537.5"},
-      {2.0, true, 2, 2, 2.0, "2"},
-      {0x1p64, true, {}, {}, 0x1p64, "1.8446744073709552e+19"},
-      {NAN, {}, {}, {}, {}, "nan"},
-      {HUGE_VAL, {}, {}, {}, {}, "inf"},
-      {"1", {}, {}, {}, {}, "1"},
-      {Array{}, {}, {}, {}, {}, {}},
-  };
-  for (const Case& c : kCases) {
+  } kCases[] = {{true, true, 1, 1, 1.0, "1"},
+                {0, false, 0, 0, 0.0, "0"},
+                {-1, true, -1, 65535, -1.0, "-1"},
+                {4294967297, true, 1, 1, 4294967297.0, "4294967297"},
+                {UINT64_MAX, true, -1, 65535, 18446744073709551616.0, "18446744073709551615"},
+                {-1.9, true, -1, 65535, -1.9, "-1.9"},
+                {65537.5, true, 65537, 1, 65537.5, "65537.5"},
+                {2.0, true, 2, 2, 2.0, "2"},
+                {0x1p64, true, {}, {}, 0x1p64, "1.8446744073709552e+19"},
+                {NAN, {}, {}, {}, {}, "nan"},
+                {HUGE_VAL, {}, {}, {}, {}, "inf"},
+                {"1", {}, {}, {}, {}, "1"},
+                {Array{}, {}, {}, {}, {}, {}}};
+  for (const auto& c : kCases) {
     SCOPED_TRACE(c.text.value_or("none"));
     EXPECT_EQ(c.value.toBoolean(), c.boolean);
     EXPECT_EQ(c.value.toInt32(), c.int32);
