@@ -6,6 +6,7 @@
 #include <cstring>
 #include <memory>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "ipc/dispatcher.h"
@@ -15,7 +16,7 @@ namespace {
 
 using namespace veltrad;
 
-// Answers every call, each in another way.
+// Counts the calls, and answers them in its own ways or not at all.
 class AnsweringSession final : public ClientSessionInterface {
  public:
   std::size_t calls = 0;
@@ -24,16 +25,15 @@ class AnsweringSession final : public ClientSessionInterface {
     ++calls;
   }
   void startConfigWithCompletionHandler(NamesReply reply) override {
-    answer(reply, std::vector<std::string>{"httppost"});
+    answer(reply, std::vector<std::string>{"x"});
   }
   void fetchStatesWithUserInfo(OptionalDictionary, NamesReply reply) override { answer(reply, std::nullopt); }
   void fetchDisplayURL(StringReply reply) override { answer(reply, "URL not available"); }
-  void sendMessageWithCategory(std::uint16_t, std::uint16_t, OptionalDictionary payload,
+  void sendMessageWithCategory(std::uint16_t, std::uint16_t, OptionalDictionary d,
                                StringReply reply) override {
-    const std::string* text = payload ? payload->string("text") : nullptr;
-    answer(reply, text ? std::optional<std::string>(*text) : std::nullopt);
+    answer(reply, d && d->string("text") ? std::optional(*d->string("text")) : std::nullopt);
   }
-  void sendMessageWithDictionary(Dictionary, StringReply) override { ++calls; }  // never answers
+  void sendMessageWithDictionary(Dictionary, StringReply) override { ++calls; }
   void flushMessagesWithCompletion(FlushReply reply) override { answer(reply, "flushed", std::nullopt); }
   void finishSessionWithReply(StringReply reply) override { answer(reply, std::nullopt); }
   void uploadFileAtPath(std::string, std::string token, BooleanReply reply) override {
@@ -58,38 +58,30 @@ class AnsweringSession final : public ClientSessionInterface {
   }
 };
 
-struct Seen {
-  std::vector<std::string> bodies;
-  std::size_t readable = 0;
-  std::size_t calls = 0;
-  bool impossible = false;
-  bool operator==(const Seen&) const = default;
-};
+// The bodies of the frames, whether the end was an impossible one, and the calls that were run.
+using Seen = std::tuple<std::vector<std::string>, bool, std::size_t>;
 
 Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
   static platform::Counters counters;
   static const auto out = std::make_shared<ipc::OutQueue>(platform::FileDescriptor(), counters);
   AnsweringSession session;
   ipc::FrameReader reader;
-  Seen seen;
-  while (size > 0 && !seen.impossible) {
+  std::vector<std::string> bodies;
+  std::size_t readable = 0;
+  auto next = ipc::FrameReader::Next();
+  while (size > 0 && next != ipc::FrameReader::Next::impossible) {
     const std::size_t count = std::min(size, piece);
     std::memcpy(reader.room(count).first, bytes, count);
     reader.received(count);
     bytes += count;
     size -= count;
-    ipc::Frame frame;
-    auto next = reader.next(frame);
-    for (; next == ipc::FrameReader::Next::frame; next = reader.next(frame)) {
-      seen.bodies.emplace_back(frame.body);
-      if (!ipc::dispatchCall(frame, session, out)) ++seen.readable;
+    for (ipc::Frame frame; (next = reader.next(frame)) == ipc::FrameReader::Next::frame;) {
+      bodies.emplace_back(frame.body);
+      if (!ipc::dispatchCall(frame, session, out)) ++readable;
     }
-    seen.impossible = next == ipc::FrameReader::Next::impossible;
   }
-  seen.calls = session.calls;
-  // A call is run exactly when it is readable.
-  if (seen.calls != seen.readable) std::abort();
-  return seen;
+  if (session.calls != readable) std::abort();  // a call is run exactly when it is readable
+  return {std::move(bodies), next == ipc::FrameReader::Next::impossible, readable};
 }
 
 }  // namespace
@@ -97,6 +89,6 @@ Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   if (size == 0) return 0;
   const std::size_t piece = data[0] == 0 ? size : data[0];
-  if (!(feed(data + 1, size - 1, size) == feed(data + 1, size - 1, piece))) std::abort();
+  if (feed(data + 1, size - 1, size) != feed(data + 1, size - 1, piece)) std::abort();
   return 0;
 }

@@ -1,6 +1,4 @@
 // Binary property lists from anyone: what is read is written and read again as the same value.
-#include <cstdlib>
-
 #include "base/property_list.h"
 #include "same_value.h"
 
@@ -9,8 +7,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   const auto read = parseBinaryPropertyList({reinterpret_cast<const char*>(bytes), size});
   if (!read.ok()) return 0;
   // Written out, shared objects are each their own: no limit that counted them at each place is passed.
-  const auto again = parseBinaryPropertyList(writeBinaryPropertyList(read.value()));
-  if (!again.ok() || !fuzz::same(read.value(), again.value())) std::abort();
+  fuzz::mustBe(read.value(), parseBinaryPropertyList(writeBinaryPropertyList(read.value())));
   // XML has no word for all of it, but for every value a text that is read.
   PropertyListLimits wide;
   wide.textBytes *= 3;

@@ -3,6 +3,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
 
 #include "base/value.h"
 
@@ -26,6 +29,12 @@ inline bool same(const Value& a, const Value& b) {
                       });
   }
   return a == b;
+}
+
+// The end of the program unless what was written is read again as the same value.
+template <typename Read>
+void mustBe(const Value& value, const Read& again) {
+  if (!again.ok() || !same(value, again.value())) std::abort();
 }
 
 }  // namespace veltrad::fuzz

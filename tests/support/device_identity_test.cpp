@@ -3,8 +3,8 @@
 
 #include <gtest/gtest.h>
 
-#include <cstring>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include "fakes/fake_device_properties.h"
@@ -13,7 +13,7 @@ namespace veltrad {
 namespace {
 
 TEST(DeviceIdentity, AsksTheServiceAnewUnderItsKeys) {
-  const std::vector<std::pair<const char*, std::optional<std::string> (DeviceIdentity::*)()>> operations = {
+  const std::pair<const char*, std::optional<std::string> (DeviceIdentity::*)()> operations[] = {
       {"ProductVersion", &DeviceIdentity::deviceProductVersion},
       {"BuildVersion", &DeviceIdentity::deviceBuildVersion},
       {"ProductType", &DeviceIdentity::deviceProductType},
@@ -25,57 +25,42 @@ TEST(DeviceIdentity, AsksTheServiceAnewUnderItsKeys) {
   DeviceIdentity device(service);
   for (const auto& [key, operation] : operations) {
     EXPECT_EQ((device.*operation)(), std::nullopt) << key;
-    service.set(key, "first");
-    EXPECT_EQ((device.*operation)(), "first") << key;
-    service.set(key, "second");
-    EXPECT_EQ((device.*operation)(), "second") << key;
+    for (const char* value : {"first", "second"}) {
+      service.set(key, value);
+      EXPECT_EQ((device.*operation)(), value) << key;
+    }
   }
 }
 
 TEST(DeviceIdentity, CopiesAUniqueIdOnlyWhereItFits) {
-  const std::string fits(40, 'a');
   fakes::FakeDeviceProperties service;
-  service.clear();
   DeviceIdentity device(service);
-  for (const std::optional<std::string>& id :
-       {std::optional<std::string>(), std::optional(fits), std::optional(std::string(41, 'a'))}) {
-    service.clear();
-    if (id) service.set("UniqueDeviceID", *id);
-    char buffer[41];
-    std::memset(buffer, 'z', sizeof buffer);
-    device.copyUniqueDeviceID(buffer, sizeof buffer);
-    const std::string kept(41, 'z');
-    EXPECT_EQ(std::string(buffer, sizeof buffer), id == fits ? fits + '\0' : kept);
+  const std::string before(41, 'z');
+  for (const std::size_t length : {1u, 40u, 41u, 100u}) {
+    const std::string id(length, 'a');
+    std::string buffer = before;
+    service.remove("UniqueDeviceID");
+    device.copyUniqueDeviceID(buffer.data(), buffer.size());
+    EXPECT_EQ(buffer, before);
+    service.set("UniqueDeviceID", id);
+    device.copyUniqueDeviceID(buffer.data(), buffer.size());
+    EXPECT_TRUE(length < 41 ? buffer.c_str() == id && buffer[40] == '\0' : buffer == before) << length;
   }
-  service.set("UniqueDeviceID", "short");
-  char buffer[41];
-  std::memset(buffer, 'z', sizeof buffer);
-  device.copyUniqueDeviceID(buffer, sizeof buffer);
-  EXPECT_STREQ(buffer, "short");
-  EXPECT_EQ(buffer[40], '\0');
 }
 
-TEST(DeviceIdentity, IsInternalOnlyByTheExactWord) {
-  const std::vector<std::pair<std::optional<std::string>, bool>> table = {
-      {std::nullopt, false}, {"Internal", true}, {"internal", false}, {"Internal ", false}, {"", false}};
-  for (const auto& [releaseType, internal] : table) {
+TEST(DeviceIdentity, IsInternalByTheExactWordOnce) {
+  const char* const absent = nullptr;
+  for (const char* releaseType : {"Internal", "internal", "Internal ", "", absent}) {
     fakes::FakeDeviceProperties service;
-    service.clear();
-    if (releaseType) service.set("ReleaseType", *releaseType);
-    EXPECT_EQ(DeviceIdentity(service).isInternalBuild(), internal) << releaseType.value_or("(absent)");
+    if (releaseType) service.set("ReleaseType", releaseType);
+    DeviceIdentity device(service);
+    const bool internal = releaseType && std::string(releaseType) == "Internal";
+    std::vector<std::thread> first;
+    for (int i = 0; i < 4; ++i) first.emplace_back([&] { EXPECT_EQ(device.isInternalBuild(), internal); });
+    for (std::thread& thread : first) thread.join();
+    service.set("ReleaseType", internal ? "" : "Internal");
+    EXPECT_EQ(device.isInternalBuild(), internal);
   }
-}
-
-TEST(DeviceIdentity, DecidesOnInternalOnce) {
-  fakes::FakeDeviceProperties service;
-  service.clear();
-  service.set("ReleaseType", "Internal");
-  DeviceIdentity device(service);
-  std::vector<std::thread> first;
-  for (int i = 0; i < 4; ++i) first.emplace_back([&] { EXPECT_TRUE(device.isInternalBuild()); });
-  for (std::thread& thread : first) thread.join();
-  service.clear();
-  EXPECT_TRUE(device.isInternalBuild());
 }
 
 }  // namespace
