@@ -35,7 +35,7 @@ class MachineFacts {
   FileStore& _files;
 };
 
-// By SMBIOS type (System Management BIOS Reference Specification, 7.4.1); nothing for types that tell
+// By SMBIOS chassis type, as the firmware numbers them; nothing for types that tell
 // nothing.
 std::optional<std::string> deviceNameOfChassisType(int type);
 

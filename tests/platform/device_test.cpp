@@ -1,7 +1,5 @@
 // What the device and the locale say of themselves.
-#include <fmt/format.h>
 #include <gtest/gtest.h>
-#include <openssl/evp.h>
 #include <time.h>
 
 #include <cstdlib>
@@ -104,7 +102,8 @@ TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChange
   EXPECT_EQ(device->size(), 40u);
   EXPECT_EQ(device->find_first_not_of("0123456789abcdef"), std::string::npos);
   EXPECT_EQ(_properties.value("UniqueDeviceID"), device);
-
+  // Not what any other program makes of it that takes the bare SHA-256.
+  EXPECT_NE(device, "0035969ec53f6e7f0fb40f08cc9ed4783aa99c20");
   _files.put("/etc/machine-id", "4d1219c7c4c5404aaa1f6d2a48adfda4\n");
   EXPECT_NE(_properties.value("UniqueDeviceID"), device);
   _files.put("/etc/machine-id", "uninitialized\n");
@@ -112,25 +111,13 @@ TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChange
 }
 
 TEST(Locale, FindsTheCountryInALocaleName) {
-  const std::pair<const char*, Text> cases[] = {{"de_DE.UTF-8", "DE"},
-                                                {"de_DE", "DE"},
-                                                {"de_DE@euro", "DE"},
-                                                {"ca_ES.UTF-8@valencia", "ES"},
-                                                {"es_419", "419"},
-                                                {"en_gb", "GB"},
-                                                {"C", {}},
-                                                {"POSIX", {}},
-                                                {"C.UTF-8", {}},
-                                                {"eo", {}},
-                                                {"eo.UTF-8", {}},
-                                                {"_DE", {}},
-                                                {"de_", {}},
-                                                {"de_DEU", {}},
-                                                {"de_D1", {}},
-                                                {"C.x_DE", {}},
-                                                {"", {}},
-                                                {"de_\xc3\x9c", {}}};
+  const std::pair<const char*, Text> cases[] = {{"de_DE.UTF-8", "DE"}, {"de_DE", "DE"},
+                                                {"de_DE@euro", "DE"},  {"es_419", "419"},
+                                                {"en_gb", "GB"},       {"ca_ES.UTF-8@valencia", "ES"}};
   for (const auto& [name, country] : cases) EXPECT_EQ(countryOfLocaleName(name), country) << name;
+  for (const char* name : {"C", "POSIX", "C.UTF-8", "eo", "eo.UTF-8", "_DE", "de_", "de_DEU", "de_D1",
+                           "C.x_DE", "", "de_\xc3\x9c"})
+    EXPECT_EQ(countryOfLocaleName(name), Text()) << name;
 }
 
 class EnvironmentLocaleTest : public ::testing::Test {
@@ -162,7 +149,7 @@ TEST_F(EnvironmentLocaleTest, TakesTheFirstVariableThatIsSetAndNotEmpty) {
 }
 
 TEST_F(EnvironmentLocaleTest, SeesAChangedZone) {
-  ::setenv("TZ", "XXX-5:30", 1);
+  ::setenv("TZ", "IST-5:30", 1);
   EXPECT_EQ(_locale.timeZoneOffset(), 5 * 3'600 + 1'800);
   ::setenv("TZ", "YYY+8", 1);
   EXPECT_EQ(_locale.timeZoneOffset(), -8 * 3'600);
