@@ -27,6 +27,11 @@ TEST(Session, CarriesAWholeConversation) {
               replyFrame(call.callID, {}));
   });
   Journal copies;
+  const auto copied = [&](const veltra::Aggregated& copy) {
+    copies.add(std::to_string(copy.timestamp) + " " + std::to_string(copy.category + copy.type) + " " +
+               std::to_string(copy.sessionInfo.item("sessionID").asUnsigned()) + " " +
+               std::string(copy.payload.item("k").item(1).string().value_or("(none)")));
+  };
   veltra::Session session{{.clientType = -3,
                            .sessionID = 4'000'000'000u,
                            .clientVersion = 65535,
@@ -34,14 +39,7 @@ TEST(Session, CarriesAWholeConversation) {
                            .serviceName = "ringer",
                            .userInfo = veltra::Dictionary{{"clientName", "overruled"}, {"build", 9u}},
                            .batchEvents = true,
-                           .aggregated =
-                               [&](const veltra::Aggregated& copy) {
-                                 copies.add(
-                                     std::to_string(copy.timestamp) + " " + std::to_string(copy.category) +
-                                     " " + std::to_string(copy.type) + " " +
-                                     std::to_string(copy.sessionInfo.item("sessionID").asUnsigned()) + " " +
-                                     std::string(copy.payload.item("k").item(1).string().value_or("(none)")));
-                               },
+                           .aggregated = copied,
                            .root = daemon.root.directory()}};
   ASSERT_TRUE(session) << session.error().description;
   EXPECT_THAT(**session.start(), ElementsAre("dashboard", "httppost"));
@@ -53,7 +51,7 @@ TEST(Session, CarriesAWholeConversation) {
   EXPECT_TRUE(session.states(veltra::Dictionary{{"list", veltra::Array{1, "two", true}}}));
   EXPECT_TRUE(session.flush());
   ASSERT_TRUE(copies.waitForLines(2));
-  EXPECT_THAT(copies.lines(), ElementsAre("12.250000 65535 2 8 two", "0.000000 0 0 0 (none)"));
+  EXPECT_THAT(copies.lines(), ElementsAre("12.250000 65537 8 two", "0.000000 0 0 (none)"));
   EXPECT_TRUE(session.finish());
   veltra::Session moved = std::move(session);
   EXPECT_EQ(moved.statistics().replies, 8u);
