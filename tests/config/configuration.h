@@ -12,7 +12,7 @@
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/fake_preferences.h"
-#include "platform/log.h"
+#include "fakes/recorded_log.h"
 #include "platform/root.h"
 #include "protocol/veltra.h"
 #include "rsa_key.h"
@@ -20,26 +20,13 @@
 
 namespace veltrad {
 
+// Lines that are to come while this lives, as "3 TEXT" with the level first; other warnings and errors fail
+// the test.
 using Lines = std::vector<std::string>;
-
-// Every line up to `most` for as long as this lives, as "3 TEXT". One at a time.
-class LogLines {
- public:
-  explicit LogLines(platform::LogLevel most = platform::LogLevel::debug)
-      : _before(platform::log::threshold.exchange(static_cast<int>(most))) {
-    platform::log::setSink([this](platform::LogLevel level, std::string_view line) {
-      _lines.push_back(std::to_string(static_cast<int>(level)) + " " + std::string(line));
-    });
+struct ExpectedLog : fakes::RecordedLog {
+  explicit ExpectedLog(const Lines& lines) {
+    for (const std::string& line : lines) expectLine(Level(line[0] - '0'), line.substr(2));
   }
-  ~LogLines() {
-    platform::log::setSink({});
-    platform::log::threshold = _before;
-  }
-  Lines take() { return std::exchange(_lines, {}); }
-
- private:
-  const int _before;
-  Lines _lines;
 };
 
 // A container around the bag bytes, signed with the shared key.

@@ -22,20 +22,16 @@ std::variant<Options, Ending> parse(std::string line) {
   }
   return parseOptions(static_cast<int>(words.size()), words.data());
 }
-Options accepted(const std::string& line) {
-  const auto parsed = parse(line);
-  const auto* ending = std::get_if<Ending>(&parsed);
-  EXPECT_FALSE(ending) << line << ": " << ending->errorOutput;
-  return ending ? Options() : std::get<Options>(parsed);
-}
-Ending ended(const std::string& line) {
-  const auto parsed = parse(line);
-  EXPECT_TRUE(std::holds_alternative<Ending>(parsed)) << line;
-  return std::holds_alternative<Ending>(parsed) ? std::get<Ending>(parsed) : Ending();
+// The one that the line gives, or the test fails.
+template <typename Parsed>
+Parsed parsed(const std::string& line) {
+  auto result = parse(line);
+  EXPECT_TRUE(std::holds_alternative<Parsed>(result)) << line;
+  return std::holds_alternative<Parsed>(result) ? std::get<Parsed>(result) : Parsed();
 }
 
 TEST(Options, sessionSaysWhoTheClientIs) {
-  const Options options = accepted(
+  const Options options = parsed<Options>(
       "--root /r session --client-type 17 --session-id 4294967295 --client-version 65535 --client 123 "
       "--service ringer --user-info build=7 region=EU --require-user-info --batch-events --aggregate "
       "--input lines.jsonl");
@@ -50,14 +46,14 @@ TEST(Options, sessionSaysWhoTheClientIs) {
   EXPECT_EQ(options.identity.userInfo,
             Dictionary({{"clientName", "123"}, {"serviceName", "ringer"}, {"build", 7}, {"region", "EU"}}));
 
-  const Options bare = accepted("session");
+  const Options bare = parsed<Options>("session");
   EXPECT_FALSE(bare.root || bare.input || bare.identity.clientType || bare.identity.sessionID);
   EXPECT_FALSE(bare.identity.clientVersion || bare.identity.userInfo || bare.identity.requireUserInfo);
   EXPECT_FALSE(bare.identity.batchEvents || bare.aggregate);
 }
 
 TEST(Options, otherCommandsTakeTheirs) {
-  const Options send = accepted(
+  const Options send = parsed<Options>(
       "send --category 65535 codec=opus --type 0 --flag 3 --user-info region=EU seconds=12.5 "
       "--client-type=7");
   EXPECT_EQ(send.command, Command::send);
@@ -66,15 +62,15 @@ TEST(Options, otherCommandsTakeTheirs) {
   EXPECT_EQ(send.flag, 3u);
   EXPECT_EQ(send.payload, Dictionary({{"codec", "opus"}, {"seconds", 12.5}}));
   EXPECT_EQ(send.identity.userInfo, Dictionary({{"region", "EU"}}));
-  EXPECT_FALSE(accepted("send --category 1 --type 2").payload);
+  EXPECT_FALSE(parsed<Options>("send --category 1 --type 2").payload);
   for (const char* line : {"--json --root there stats", "stats --json --root there"}) {
-    const Options stats = accepted(line);
+    const Options stats = parsed<Options>(line);
     EXPECT_EQ(stats.command, Command::stats);
     EXPECT_TRUE(stats.json);
     EXPECT_EQ(stats.root, "there");
   }
-  EXPECT_EQ(accepted("states").command, Command::states);
-  EXPECT_EQ(accepted("display-url").command, Command::displayURL);
+  EXPECT_EQ(parsed<Options>("states").command, Command::states);
+  EXPECT_EQ(parsed<Options>("display-url").command, Command::displayURL);
 }
 
 TEST(Options, wrongUsageSaysWhatWasExpected) {
@@ -98,7 +94,7 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
       {"send --category 1 --type 1 =x", "\"=x\": expected KEY=VALUE"},
   };
   for (const auto& [line, text] : cases) {
-    const Ending ending = ended(line);
+    const Ending ending = parsed<Ending>(line);
     EXPECT_TRUE(ending.status == 2 && ending.output.empty()) << line;
     EXPECT_THAT(ending.errorOutput, HasSubstr(text)) << line;
   }
@@ -107,7 +103,7 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
 TEST(Options, helpHasAnExampleAndOffersWhatThereIs) {
   for (const char* line : {"--help", "session --help", "send --help", "states --help", "display-url --help",
                            "stats --help", "--version"}) {
-    const Ending ending = ended(line);
+    const Ending ending = parsed<Ending>(line);
     EXPECT_TRUE(ending.status == 0 && ending.errorOutput.empty()) << line;
     EXPECT_THAT(ending.output, AnyOf(HasSubstr("Example"), "veltractl 8.0\n")) << line;
     EXPECT_THAT(ending.output, Not(AnyOf(HasSubstr("one-shot"), HasSubstr("upload")))) << line;
