@@ -1,5 +1,9 @@
-"""Plays examples/call.jsonl against a lab and a daemon in a temporary root, and shows both ends of the road."""
+"""Publishes examples/storebag.json, plays examples/call.jsonl and examples/lamp.jsonl against a lab and a daemon in a
+temporary root, and shows both ends of the road. Status 0: what was to arrive did, and nothing else."""
+import collections
+import contextlib
 import json
+import re
 import shlex
 import signal
 import subprocess
@@ -9,89 +13,163 @@ from pathlib import Path
 
 SOURCE = Path(__file__).resolve().parent.parent
 sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
-from harness import Daemon, Lab, Root, program  # noqa: E402
+from harness import Daemon, Lab, Root, program, wait_until  # noqa: E402
 
-CALL = SOURCE / "examples" / "call.jsonl"
-SESSION = ["session", "--client-type", "6", "--session-id", "42", "--client-version", "3"]
-# The session itself reports its start and its end.
-EVENTS = sum('"send"' in line or '"finish"' in line for line in CALL.read_text().splitlines()) + 2
+EXAMPLES = SOURCE / "examples"
+PHONE = ["session", "--client-type", "6", "--session-id", "42", "--client-version", "3", "--client", "phone",
+         "--service", "ringer", "--user-info", "line=2", "--require-user-info", "--batch-events"]
+LAMP = ["session", "--client-type", "6", "--session-id", "43", "--client", "lamp", "--service", "hall",
+        "--require-user-info"]
 
 
-def storebag(url):
-    entry = {"post_url": url + "/collect/events", "realtime_post_url": url + "/collect/realtime", "filters": []}
-    section = {"httppost": {"display_url": "https://reports.example/call/42", "clients": [entry]}}
-    return {"release": section, "version": "1.0-example", "refresh_cycle": 3600}
+def messages(name):
+    """(category, type) of every message of a client. The session itself reports its start and its end."""
+    lines = [json.loads(line) for line in (EXAMPLES / name).read_text().splitlines()]
+    own = [(0, 0), (0, 1)] + [(0, 2) for line in lines if line["op"] == "finish"]
+    return collections.Counter(own + [(line["category"], line["type"]) for line in lines if line["op"] == "send"])
+
+
+def kind(event):
+    return event["_method"], event["_status"]
 
 
 def heading(text):
     print(f"\n\033[1m{text}\033[0m" if sys.stdout.isatty() else f"\n{text}", flush=True)
 
 
+def posted(reply):
+    """The events in a reply: one text of JSON, or two with words before them."""
+    texts = re.split(r"^(?:Flushed events|Standalone event):$", reply, flags=re.M)
+    return [event for text in texts if text.strip() for event in json.loads(text)["events"]]
+
+
 def show_answers(output):
-    heading("What the client was answered")
     for line in output.splitlines():
         answer = json.loads(line)
-        operation = answer.pop("op")
-        reply = answer.get("reply")
-        if isinstance(reply, str) and reply.startswith("{"):
-            event = json.loads(reply)["events"][0]
-            answer = f"event {event['_eventNumber']} (category {event['_method']}, type {event['_status']}) was posted"
+        operation, reply = answer.pop("op"), answer.get("reply")
+        if isinstance(reply, str) and "{" in reply:
+            events = posted(reply)
+            answer = f"{len(events)} event{'s'[:len(events) - 1]} posted, number {events[0]['_eventNumber']}"
+            answer += f" to {events[-1]['_eventNumber']}" if len(events) > 1 else ""
         print(f"  {operation:<11} {answer if isinstance(answer, str) else json.dumps(answer)}")
 
 
+def play(root, name, session):
+    """What the client was answered."""
+    command = [program("veltractl"), "--root", str(root.path), *session, "--input", str(EXAMPLES / name)]
+    done = subprocess.run(command, capture_output=True, text=True, timeout=60)
+    sys.stderr.write(done.stderr)
+    assert done.returncode == 0, f"veltractl ended with status {done.returncode}"
+    return done.stdout
+
+
+def line_of(event):
+    own = {"eventTime", "clientName", "serviceName"}
+    fields = [f"{key}={value if len(str(value)) <= 24 else str(value)[:12] + '…'}" for key, value in event.items()
+              if key[0] != "_" and key not in own]
+    return f"{event['_eventNumber']:>3}  {event['_method']:>2}/{event['_status']:<3} {' '.join(fields)}"
+
+
 def show_posts(posts):
-    heading("What arrived at the collector")
+    heading("What arrived at the collector: number, category/type, the client's own fields\n"
+            "(filters have removed peer and hashed number)")
     for post in posts:
         print(f"  POST {post['path']}  {post['bytes']} bytes{', gzip' if post['compressed'] else ''}")
         for name, value in sorted(post["headers"].items()):
             print(f"    {name}: {value}")
-        for line in json.dumps(post["body"], indent=2, ensure_ascii=False).splitlines():
-            print(f"    {line}")
+        for event in post["body"]["events"]:
+            print(f"    {line_of(event)}")
+
+
+def show_message_log(root):
+    heading("What the owner of the device can read of it: the message log")
+    for path in sorted((root.path / "var/mobile/Library/Logs/Zentrel/Retired").glob("*.diag")):
+        entries = re.split(r"^(?=\(\d{4}-)", path.read_text(), flags=re.M)[1:]
+        for entry in entries:
+            first, *rest = entry.splitlines()
+            print(f"  {first} … and {len(rest)} lines")
+
+
+def show_stats(root):
+    taken = messages("call.jsonl").total() + messages("lamp.jsonl").total()
+
+    def stats():
+        done = subprocess.run([program("veltractl"), "--root", str(root.path), "stats"], capture_output=True, text=True)
+        return done.stdout if f"{taken}  message taken in" in done.stdout else None
+    heading("veltractl stats")
+    print("  " + wait_until(stats, f"{taken} messages counted").replace("\n", "\n  ").rstrip())
+
+
+def check(posts):
+    """What is wrong with what arrived."""
+    events = [event for post in posts for event in post["body"]["events"]]
+    arrived, expected = collections.Counter(map(kind, events)), messages("call.jsonl")
+    problems = [f"category {c}, type {t}: {arrived[c, t]} of {expected[c, t]} arrived"
+                for c, t in sorted(arrived | expected) if arrived[c, t] != expected[c, t]]
+    problems += ["a field that is to be removed arrived" for event in events if "peer" in event]
+    problems += ["a field that is to be hashed arrived as it was" for event in events
+                 if not re.fullmatch("[0-9a-f]{64}", event.get("number", "0" * 64))]
+    problems += [f"a post to {post['path']}" for post in posts
+                 if (post["path"] == "/collect/realtime") != (kind(post["body"]["events"][0]) == (6, 20))]
+    return problems
 
 
 def stay(root, lab):
     control = shlex.join([program("veltractl"), "--root", str(root.path)])
     heading("Up until Ctrl-C. In another terminal, try:")
-    print(f"  {control} {shlex.join(SESSION)}")
-    print("""    and then lines such as {"op":"send","category":5,"type":1,"payload":{"codec":"opus"}}""")
-    print(f"  {control} send --client-type 6 --category 5 --type 1 codec=opus seconds=12.5")
+    print(f"  {control} {shlex.join(PHONE)}")
+    print("""    and then lines such as {"op":"send","category":5,"type":10,"payload":{"codec":"opus"}}""")
+    print(f"  {control} send --client-type 6 --client phone --service ringer --require-user-info "
+          "--category 5 --type 10 codec=opus seconds=12.5")
     print(f"  {control} stats")
     print(f"  VELTRA_ROOT={root.path} {program('hello')}")
     print(f"  open {lab.url}/ in a browser: what arrives, live (the certificate is the lab's own)")
-    print(f"  edit {lab.path}/storebags/ostvane.plist: what the daemon is told (signed at each request)", flush=True)
+    print(f"  edit {lab.path}/storebags/ostvane.json: what the daemon is told (signed at each request)", flush=True)
     stopped = threading.Event()
     for number in (signal.SIGINT, signal.SIGTERM):
         signal.signal(number, lambda *_: stopped.set())
     stopped.wait()
 
 
-def play(root, lab):
-    print("starting the daemon", file=sys.stderr)
-    daemon = Daemon(root)
-    try:
-        print(f"playing {CALL.relative_to(SOURCE)} through veltractl session", file=sys.stderr)
-        done = subprocess.run([program("veltractl"), "--root", str(root.path), *SESSION, "--input", str(CALL)],
-                              capture_output=True, text=True, timeout=60)
-        sys.stderr.write(done.stderr)
-        show_answers(done.stdout)
-        show_posts(lab.received("events", EVENTS))
-        heading(f"{EVENTS} of {EVENTS} events arrived")
-        if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
-            stay(root, lab)
-        return done.returncode
-    finally:
-        daemon.stop()
+def show(root, lab, daemon):
+    print("playing examples/call.jsonl, then examples/lamp.jsonl, through veltractl session", file=sys.stderr)
+    answers = play(root, "call.jsonl", PHONE)
+    lamp = play(root, "lamp.jsonl", LAMP)
+    heading("What the phone was answered, which lets its events be batched")
+    show_answers(answers)
+    heading("What the lamp was answered, which is sampled out")
+    show_answers(lamp)
+    expected = messages("call.jsonl").total()
+    with contextlib.suppress(AssertionError):  # then check() says which are missing
+        wait_until(lambda: len(lab.events()) >= expected, "the events")
+    daemon.wait_for_line("dealloc: VeltradSession dealloc: 43")
+    posts = lab.received("events")
+    show_posts(posts)
+    show_message_log(root)
+    show_stats(root)
+    problems = check(posts)
+    if json.loads(lamp.splitlines()[0])["backends"] != []:
+        problems.append("the lamp was told that something reports")
+    heading("\n".join(problems) or f"{expected} of {expected} events arrived, none of the lamp's")
+    return 1 if problems else 0
 
 
 def main():
     root = Root()
-    print(f"starting the lab; this run's root is {root.path}", file=sys.stderr)
+    print(f"starting the lab and the daemon; this run's root is {root.path}", file=sys.stderr)
     lab = Lab()
     try:
         root.use(lab)
-        root.prefer(environmentType=4)
-        lab.put("ostvane", storebag(lab.url))
-        return play(root, lab)
+        (lab.path / "storebags/ostvane.json").write_bytes((EXAMPLES / "storebag.json").read_bytes())
+        daemon = Daemon(root)
+        try:
+            status = show(root, lab, daemon)
+            if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
+                daemon.allow("<")  # whatever is tried
+                stay(root, lab)
+        finally:
+            daemon.stop()
+        return status
     except AssertionError as fault:
         print(f"scripts/run: {fault}", file=sys.stderr)
         return 1
