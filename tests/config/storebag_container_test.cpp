@@ -29,14 +29,12 @@ TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
     ASSERT_FALSE(container) << bytes.substr(0, 60);
     EXPECT_EQ(container.error().kind, kind) << bytes.substr(0, 60) << ": " << container.error().detail;
   }
-  const auto bag = [](int more) {
-    return writeBinaryPropertyList(
-        Dictionary{{"x", Array(static_cast<std::size_t>(65'534 + more), Value(1))}});
-  };
-  EXPECT_TRUE(parseStorebagBag(bag(-1)));
-  EXPECT_FALSE(parseStorebagBag(bag(1)));
-  for (const std::string& bytes : {writeXMLPropertyList(Array{}), std::string("no list"), nestedArrays(33)})
-    EXPECT_FALSE(parseStorebagBag(bytes)) << bytes.substr(0, 60);
+  Dictionary bag;
+  for (int depth = 1; depth < kStorebagBagLimits.depth; ++depth) bag = Dictionary{{"deeper", bag}};
+  EXPECT_EQ(parseStorebagBag(writeBinaryPropertyList(bag)), bag);
+  EXPECT_FALSE(parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
+  for (const std::string& bytes : {writeXMLPropertyList(Array{}), std::string("no list")})
+    EXPECT_FALSE(parseStorebagBag(bytes));
 }
 
 }  // namespace

@@ -55,6 +55,8 @@ TEST(StorebagLint, LooksThroughEveryEntry) {
 TEST(StorebagLint, LooksThroughWhatIsAroundThem) {
   Dictionary everyone = kGood;
   everyone.erase("client");
+  Dictionary oneService = everyone;
+  oneService.set("service", "ringer");
   const std::pair<Dictionary, const char*> table[] = {
       {{{"release", Dictionary{}}}, R"(storebag: no "version": )"},
       {{{"version", "1"}}, R"(storebag: no "release": )"},
@@ -68,7 +70,7 @@ TEST(StorebagLint, LooksThroughWhatIsAroundThem) {
   };
   for (const auto& [bag, finding] : table)
     EXPECT_THAT(lintStorebag(bag), testing::ElementsAre(testing::StartsWith(finding)));
-  EXPECT_THAT(lintStorebag(clients(Array{kGood, everyone})), testing::IsEmpty());
+  EXPECT_THAT(lintStorebag(clients(Array{kGood, oneService, everyone})), testing::IsEmpty());
 }
 
 }  // namespace
