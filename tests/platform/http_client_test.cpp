@@ -52,6 +52,8 @@ class HTTPClientTest : public testing::Test {
   static inline const TLSAnswer kOK{200, {}, "ok"};
   static inline const TLSAnswer kSilent{200, {}, "", Shape::silent};
   const TestCertificates certificates;
+  TLSServer hung{certificates, always(kSilent)};
+  TLSServer healthy{certificates, always(kOK)};
   const fakes::TemporaryDirectory place;
   CurlHTTPClient client{{place.path("ca.pem")}};
 };
@@ -136,17 +138,13 @@ TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
 }
 
 TEST_F(HTTPClientTest, UnreachableServersAreTransportErrors) {
-  std::string refused;
-  {
-    TLSServer gone(certificates, always({}));
-    refused = gone.url();
-  }
+  const std::string refused = TLSServer(certificates, always({})).url();
   EXPECT_TRANSPORT_ERROR(client.perform(get(refused)), HasSubstr("connect"));
   EXPECT_TRANSPORT_ERROR(client.perform(get("https://host.invalid/")),
                          "Could not resolve host: host.invalid");
   EXPECT_TRANSPORT_ERROR(client.perform(get("http://127.0.0.1:1/")), HasSubstr("http"));
-  EXPECT_TRANSPORT_ERROR(client.perform(get("")), Not(testing::IsEmpty()));
-  EXPECT_TRANSPORT_ERROR(client.perform(get("https://a b\r\nc/")), Not(testing::IsEmpty()));
+  for (const char* none : {"", "https://a b\r\nc/"})
+    EXPECT_TRANSPORT_ERROR(client.perform(get(none)), Not(testing::IsEmpty()));
 }
 
 TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {
@@ -166,8 +164,6 @@ TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {
 }
 
 TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
-  TLSServer hung(certificates, always(kSilent));
-  TLSServer healthy(certificates, always(kOK));
   std::atomic<int> stopped{0};
   const auto countStopped = [&](HTTPResult result) {
     if (!result.ok() && result.error().kind == HTTPError::Kind::stopping) ++stopped;
@@ -189,15 +185,12 @@ TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
 }
 
 TEST_F(HTTPClientTest, EventBodiesAreBoundedInAll) {
-  TLSServer hung(certificates, always(kSilent));
   auto first = start(post(hung.url(), std::string(40u << 20, 'x')));
   EXPECT_EQ(start(post(hung.url(), std::string(25u << 20, 'x'))).get().error().kind,
             HTTPError::Kind::tooMany);
 }
 
 TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOut) {
-  TLSServer hung(certificates, always(kSilent));
-  TLSServer healthy(certificates, always(kOK));
   std::vector<std::future<HTTPResult>> waiting;
   for (int i = 0; i < 20; ++i) {
     HTTPRequest request = post(hung.url(), "x");
@@ -234,7 +227,6 @@ TEST_F(HTTPClientTest, UploadsRunTwoAtATimeInOrder) {
 }
 
 TEST_F(HTTPClientTest, WaitersAreFreedAndLaterOnesFailAtOnce) {
-  TLSServer hung(certificates, always(kSilent));
   auto waiter = std::async(std::launch::async, [&] { return client.perform(get(hung.url())); });
   auto event = start(post(hung.url(), "x"));
   ASSERT_TRUE(hung.waitForRequests(2));
@@ -245,18 +237,16 @@ TEST_F(HTTPClientTest, WaitersAreFreedAndLaterOnesFailAtOnce) {
 }
 
 TEST_F(HTTPClientTest, DrainWaitsForWhatEndsInTime) {
-  TLSServer server(certificates, always(kOK));
   std::atomic<int> done{0};
   for (int i = 0; i < 50; ++i) {
-    client.start(post(server.url(), "x"), [&](HTTPResult result) { done += result.ok() ? 1 : 0; });
+    client.start(post(healthy.url(), "x"), [&](HTTPResult result) { done += result.ok() ? 1 : 0; });
   }
   client.drain(std::chrono::steady_clock::now() + 20s);
   EXPECT_EQ(done, 50);
-  EXPECT_TRUE(client.perform(get(server.url())).ok());
+  EXPECT_TRUE(client.perform(get(healthy.url())).ok());
 }
 
 TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
-  TLSServer hung(certificates, always(kSilent));
   std::atomic<int> first{0}, second{0};
   {
     CurlHTTPClient mine({place.path("ca.pem")});
