@@ -115,7 +115,8 @@ std::optional<Rule> Misbehaviour::take(std::string_view path) {
       best = rule;
   }
   if (best == _rules.end()) return std::nullopt;
-  const Rule taken = *best;
+  Rule taken = *best;
+  taken.generation = _generation;
   if (best->times && --*best->times == 0) _rules.erase(best);
   return taken;
 }
@@ -135,13 +136,12 @@ void Misbehaviour::stop() {
   _changed.notifyAll();
 }
 
-bool Misbehaviour::hold(std::optional<std::chrono::milliseconds> time) {
+bool Misbehaviour::hold(std::uint64_t generation, std::optional<std::chrono::milliseconds> time) {
   const auto until = std::chrono::steady_clock::now() + time.value_or(std::chrono::hours(24 * 365));
   const Lock hold(_mutex);
-  const std::uint64_t before = _generation;
-  while (!_stopped && _generation == before && std::chrono::steady_clock::now() < until)
+  while (!_stopped && _generation == generation && std::chrono::steady_clock::now() < until)
     _changed.waitUntil(_mutex, until);
-  return !_stopped && _generation == before;
+  return !_stopped && _generation == generation;
 }
 
 bool Misbehaviour::stopped() const {

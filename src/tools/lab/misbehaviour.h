@@ -31,7 +31,8 @@ struct Rule {
   Signature sign = Signature::right;
   bool lastModified = true;  // false: no "Last-Modified" header
   std::optional<std::string> body;
-  Dictionary headers;  // texts; they replace headers of the same name
+  Dictionary headers;            // texts; they replace headers of the same name
+  std::uint64_t generation = 0;  // set by take(): the rules' generation at that time
 };
 
 // The rule that the JSON object says; else one line that names the key and what was expected.
@@ -47,9 +48,9 @@ class Misbehaviour {
   void reset();
   // As reset(), and nobody waits any more.
   void stop();
-  // Waits until the time has passed, or without end where there is none. False: the rules were reset
-  // meanwhile, or the lab stops.
-  bool hold(std::optional<std::chrono::milliseconds> time);
+  // Waits until the time has passed, or without end where there is none. False: the rules have been reset
+  // since that generation, or the lab stops.
+  bool hold(std::uint64_t generation, std::optional<std::chrono::milliseconds> time);
   bool stopped() const;
   // Changes with every reset; a body without end lasts as long as it does not change.
   std::uint64_t generation() const;

@@ -88,8 +88,8 @@ struct Server::Library {
   void received(const httplib::Request& request, httplib::Response& response);
   void send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
             const std::optional<Rule>& rule);
-  void sendEndless(httplib::Response& response, const std::string& type);
-  void sendDripping(httplib::Response& response, const Answer& answer, std::chrono::milliseconds apart);
+  void sendEndless(httplib::Response& response, const Rule& rule, const std::string& type);
+  void sendDripping(httplib::Response& response, const Rule& rule, const Answer& answer);
 
   Server& lab;
   Connections connections;  // before the server, whose context it watches
@@ -214,37 +214,34 @@ void Server::Library::received(const httplib::Request& request, httplib::Respons
 void Server::Library::send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
                            const std::optional<Rule>& rule) {
   response.status = answer.status;
-  if (rule && rule->delay.count() > 0) lab._misbehaviour.hold(rule->delay);
-  if (rule && rule->stall) lab._misbehaviour.hold(std::nullopt);
+  if (rule && rule->delay.count() > 0) lab._misbehaviour.hold(rule->generation, rule->delay);
+  if (rule && rule->stall) lab._misbehaviour.hold(rule->generation, std::nullopt);
   if (rule && (rule->cut || (rule->stall && lab._misbehaviour.stopped())))
     return Connections::cut(request.ssl);
   for (const auto& [name, text] : answer.headers) response.set_header(name, text.toText().value_or(""));
-  if (rule && rule->endless) return sendEndless(response, answer.type);
+  if (rule && rule->endless) return sendEndless(response, *rule, answer.type);
   if (rule && rule->cutHalfway) return sendAndEnd(response, answer.body, answer.body.size() / 2, answer.type);
   if (answer.body.empty()) return;
-  if (rule && rule->drip) return sendDripping(response, answer, *rule->drip);
+  if (rule && rule->drip) return sendDripping(response, *rule, answer);
   response.set_content(answer.body, answer.type);
 }
 
-void Server::Library::sendEndless(httplib::Response& response, const std::string& type) {
+void Server::Library::sendEndless(httplib::Response& response, const Rule& rule, const std::string& type) {
   response.set_chunked_content_provider(
-      type, [this, piece = std::string(kPieceBytes, 'x'), generation = lab._misbehaviour.generation()](
+      type, [this, piece = std::string(kPieceBytes, 'x'), generation = rule.generation](
                 std::size_t, httplib::DataSink& sink) {
         return lab._misbehaviour.generation() == generation && sink.write(piece.data(), piece.size());
       });
 }
 
-// The reset sends what is left at once.
-void Server::Library::sendDripping(httplib::Response& response, const Answer& answer,
-                                   std::chrono::milliseconds apart) {
-  response.set_content_provider(
-      answer.body.size(), answer.type,
-      [this, body = answer.body, apart, generation = lab._misbehaviour.generation()](
-          std::size_t sent, std::size_t left, httplib::DataSink& sink) {
-        if (sent > 0) lab._misbehaviour.hold(apart);
-        const bool reset = lab._misbehaviour.generation() != generation;
-        return sink.write(&body[sent], reset ? left : 1);
-      });
+// A byte at a time; the reset sends what is left at once.
+void Server::Library::sendDripping(httplib::Response& response, const Rule& rule, const Answer& answer) {
+  response.set_content_provider(answer.body.size(), answer.type,
+                                [this, body = answer.body, apart = rule.drip, generation = rule.generation](
+                                    std::size_t sent, std::size_t left, httplib::DataSink& sink) {
+                                  const bool drips = sent == 0 || lab._misbehaviour.hold(generation, apart);
+                                  return sink.write(&body[sent], drips ? 1 : left);
+                                });
 }
 
 Server::Server(const Directory& directory, int maxAge)
