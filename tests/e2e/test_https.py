@@ -4,12 +4,13 @@ import datetime
 import hashlib
 import itertools
 import json
+import os
+import pathlib
 import plistlib
 import re
 import shutil
-import time
 
-from harness import DEVICE, Lab, SystemTest, Wire, closed_port, storebag, wait_until
+from harness import BUILD, DEVICE, Lab, SystemTest, Wire, closed_port, storebag, wait_until
 
 NAMES = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 LOGS = "var/mobile/Library/Logs/Zentrel/Retired"
@@ -247,10 +248,12 @@ class Entries(HTTPSTest):
         actions = ("remove", "sha256", "keep")
         filters = [{"key": f"field{n}", "action": actions[n % 3], "method": 5} for n in range(1000)]
         self.serve(*(entry(f"client{n:03}") for n in range(999)), entry("phone", filters=filters))
-        with self.serving():
-            begin = time.monotonic()
+        with self.serving() as daemon:
             client = self.client()
-            self.assertLess(time.monotonic() - begin, 1)
+            # The processor's seconds, which a busy machine does not stretch; sanitizers do.
+            fields = pathlib.Path(f"/proc/{daemon.popen.pid}/stat").read_text().rsplit(")", 1)[1].split()
+            seconds = sum(map(int, fields[11:13])) / os.sysconf("SC_CLK_TCK")
+            self.assertLess(seconds, 1 if BUILD.name in ("dev", "release") else 10)
             event = client.event(**{f"field{n}": "x" for n in range(0, 1000, 10)})
         kept = {key: value for key, value in event.items() if key.startswith("field")}
         self.assertEqual({key: len(value) for key, value in kept.items()},
