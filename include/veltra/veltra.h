@@ -1,14 +1,14 @@
 /* libveltra: report to veltrad from C. See veltra.hpp for the same in C++20.
  *
- * Threads: every function may be called from any thread; calls on one session are carried out in the order in which
- * they were made. Callbacks run on a thread of the session's own, one at a time; a waiting call inside a callback is
- * refused with VELTRA_WOULD_DEADLOCK.
+ * Threads: every function may be called from any thread; calls on one session are carried out in the order in
+ * which they were made. Callbacks run on a thread of the session's own, one at a time; a waiting call inside
+ * a callback is refused with VELTRA_WOULD_DEADLOCK.
  *
- * Nothing here throws, and no function but those that end in _wait, veltra_session_close and veltra_session_create
- * waits for anything.
+ * Nothing here throws, and no function but those that end in _wait, veltra_session_close and
+ * veltra_session_create waits for anything.
  *
- * Processes: the descriptors are closed by exec. After a fork the session belongs to the parent: the child must not
- * use it, close included, and opens one of its own. No signal handler runs on a session's thread.
+ * Processes: the descriptors are closed by exec. After a fork the session belongs to the parent: the child
+ * must not use it, close included, and opens one of its own. No signal handler runs on a session's thread.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -25,13 +25,13 @@ extern "C" {
 
 typedef enum veltra_status {
   VELTRA_OK = 0,
-  VELTRA_NO_DAEMON = 1,       /* nobody listens on the socket, or the connection has ended */
-  VELTRA_REFUSED = 2,         /* the daemon refused the connection or the call */
-  VELTRA_QUEUE_FULL = 3,      /* the session's queue is full; the call was dropped and counted */
-  VELTRA_INVALID = 4,         /* an argument is not what it must be; nothing was done */
-  VELTRA_NO_REPLY = 5,        /* the call ended without an answer */
-  VELTRA_WOULD_DEADLOCK = 6,  /* a waiting call inside a callback */
-  VELTRA_TOO_LARGE = 7,       /* the call does not fit a frame (1 MiB; log data 64 MiB); nothing was sent */
+  VELTRA_NO_DAEMON = 1,      /* nobody listens on the socket, or the connection has ended */
+  VELTRA_REFUSED = 2,        /* the daemon refused the connection or the call */
+  VELTRA_QUEUE_FULL = 3,     /* the session's queue is full; the call was dropped and counted */
+  VELTRA_INVALID = 4,        /* an argument is not what it must be; nothing was done */
+  VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
+  VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
+  VELTRA_TOO_LARGE = 7,      /* the call does not fit a frame (1 MiB; log data 64 MiB); nothing was sent */
 } veltra_status;
 
 /* A short English text for a status; static. */
@@ -41,10 +41,10 @@ VELTRA_API const char* veltra_version(void);
 
 /* ---- Values: booleans, integers, reals, texts (UTF-8), dates, data, arrays, dictionaries ----
  *
- * Counted references: each create returns one reference, which the caller releases, or hands over where a function
- * says that it takes it. A value that is part of another cannot be changed any more (VELTRA_INVALID); containers nest
- * at most 64 deep. Bytes of a text that are no UTF-8 become U+FFFD. NULL is "no value" and every function takes it as
- * such.
+ * Counted references: each create returns one reference, which the caller releases, or hands over where a
+ * function says that it takes it. A value that is part of another cannot be changed any more
+ * (VELTRA_INVALID); containers nest at most 64 deep. Bytes of a text that are no UTF-8 become U+FFFD. NULL is
+ * "no value" and every function takes it as such.
  */
 typedef struct veltra_value veltra_value;
 
@@ -72,10 +72,11 @@ VELTRA_API veltra_value* veltra_data(const void* bytes, size_t length);
 VELTRA_API veltra_value* veltra_array(void);
 VELTRA_API veltra_value* veltra_dictionary(void);
 
-/* Both take over the reference to `value`, also when they fail (VELTRA_INVALID: wrong kind of container, no key, no
- * value, nested too deep). A key that is there already gets the new value. */
+/* Both take over the reference to `value`, also when they fail (VELTRA_INVALID: wrong kind of container, no
+ * key, no value, nested too deep). A key that is there already gets the new value. */
 VELTRA_API veltra_status veltra_array_append(veltra_value* array, veltra_value* value);
-VELTRA_API veltra_status veltra_dictionary_set(veltra_value* dictionary, const char* key, veltra_value* value);
+VELTRA_API veltra_status veltra_dictionary_set(veltra_value* dictionary, const char* key,
+                                               veltra_value* value);
 
 VELTRA_API veltra_value* veltra_retain(const veltra_value* value);
 VELTRA_API void veltra_release(const veltra_value* value);
@@ -83,9 +84,10 @@ VELTRA_API void veltra_release(const veltra_value* value);
 VELTRA_API veltra_type veltra_type_of(const veltra_value* value);
 /* The value by its type; false, 0 or NULL for another type. The pointers live as long as the value. */
 VELTRA_API bool veltra_get_boolean(const veltra_value* value);
-VELTRA_API int64_t veltra_get_signed(const veltra_value* value);    /* also of an unsigned one that fits */
-VELTRA_API uint64_t veltra_get_unsigned(const veltra_value* value); /* also of a signed one that is not negative */
-VELTRA_API double veltra_get_real(const veltra_value* value);       /* also of an integer, and of a date */
+VELTRA_API int64_t veltra_get_signed(const veltra_value* value); /* also of an unsigned one that fits */
+VELTRA_API uint64_t
+veltra_get_unsigned(const veltra_value* value);               /* also of a signed one that is not negative */
+VELTRA_API double veltra_get_real(const veltra_value* value); /* also of an integer, and of a date */
 VELTRA_API const char* veltra_get_string(const veltra_value* value, size_t* length); /* NUL-terminated too */
 VELTRA_API const void* veltra_get_data(const veltra_value* value, size_t* length);
 /* Items of an array, entries of a dictionary (in ascending order of the keys' bytes); 0 for anything else. */
@@ -108,7 +110,8 @@ VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* leng
 /* The backends that report: an array of texts, or NULL when none could be had. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
-/* The error of the answer (of a flush, say) or of the call itself; domain and description are NULL without one. */
+/* The error of the answer (of a flush, say) or of the call itself; domain and description are NULL without
+ * one. */
 VELTRA_API const char* veltra_reply_error_domain(const veltra_reply* reply);
 VELTRA_API int64_t veltra_reply_error_code(const veltra_reply* reply);
 VELTRA_API const char* veltra_reply_error_description(const veltra_reply* reply);
@@ -137,40 +140,44 @@ typedef struct veltra_session_options {
   uint16_t client_version;
   bool require_user_info;
   bool batch_events;
-  /* User info: the dictionary given, with the two names added where they are not NULL. All three NULL: no user info.
-   * Borrowed for the call. */
+  /* User info: the dictionary given, with the two names added where they are not NULL. All three NULL: no
+   * user info. Borrowed for the call. */
   const veltra_value* user_info;
   const char* client_name;
   const char* service_name;
   /* Not NULL: this session aggregates. */
   veltra_aggregation_callback aggregated;
   void* aggregated_context;
-  /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped; one that has the queue
-   * for itself may be larger. */
+  /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped; one that has the
+   * queue for itself may be larger. */
   size_t queue_bytes;
 } veltra_session_options;
 
 /* Fills in the defaults and `size`. */
 VELTRA_API void veltra_session_options_init(veltra_session_options* options);
 
-/* Connects and describes the session. NULL on failure; then `*error`, when `error` is not NULL, is a text that says
- * what is wrong and what to do, to be freed with veltra_free, and `*status`, when not NULL, the status. */
+/* Connects and describes the session. NULL on failure; then `*error`, when `error` is not NULL, is a text
+ * that says what is wrong and what to do, to be freed with veltra_free, and `*status`, when not NULL, the
+ * status. */
 VELTRA_API veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
                                                  char** error);
 VELTRA_API void veltra_free(char* text);
 
-/* Without _wait: VELTRA_OK means that the call is on its way and `callback` (when not NULL) will run exactly once;
- * anything else means that nothing was sent and the callback will not run. With _wait: waits for the answer; `*reply`
- * (when `reply` is not NULL) is set in every case and is to be released; the result is the reply's status. */
+/* Without _wait: VELTRA_OK means that the call is on its way and `callback` (when not NULL) will run exactly
+ * once; anything else means that nothing was sent and the callback will not run. With _wait: waits for the
+ * answer; `*reply` (when `reply` is not NULL) is set in every case and is to be released; the result is the
+ * reply's status. */
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
 
-/* `payload` is a dictionary or NULL, borrowed. flag: 1 and 3 realtime, 2 and 3 override sampling, 0 neither. */
+/* `payload` is a dictionary or NULL, borrowed. flag: 1 and 3 realtime, 2 and 3 override sampling, 0 neither.
+ */
 VELTRA_API veltra_status veltra_session_send(veltra_session*, uint16_t category, uint16_t type,
                                              const veltra_value* payload, uint32_t flag, veltra_callback,
                                              void* context);
 VELTRA_API veltra_status veltra_session_send_wait(veltra_session*, uint16_t category, uint16_t type,
-                                                  const veltra_value* payload, uint32_t flag, veltra_reply** reply);
+                                                  const veltra_value* payload, uint32_t flag,
+                                                  veltra_reply** reply);
 /* A message dictionary as it is: "category", "type", "payload", "flag"; the daemon checks it. */
 VELTRA_API veltra_status veltra_session_send_dictionary(veltra_session*, const veltra_value* message,
                                                         veltra_callback, void* context);
@@ -180,8 +187,8 @@ VELTRA_API veltra_status veltra_session_send_dictionary_wait(veltra_session*, co
 VELTRA_API veltra_status veltra_session_flush(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply** reply);
 /* `user_info` is a dictionary or NULL: the session's new user info. */
-VELTRA_API veltra_status veltra_session_states(veltra_session*, const veltra_value* user_info, veltra_callback,
-                                               void* context);
+VELTRA_API veltra_status veltra_session_states(veltra_session*, const veltra_value* user_info,
+                                               veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_states_wait(veltra_session*, const veltra_value* user_info,
                                                     veltra_reply** reply);
 VELTRA_API veltra_status veltra_session_display_url(veltra_session*, veltra_callback, void* context);
@@ -190,19 +197,20 @@ VELTRA_API veltra_status veltra_session_finish(veltra_session*, veltra_callback,
 VELTRA_API veltra_status veltra_session_finish_wait(veltra_session*, veltra_reply** reply);
 
 typedef struct veltra_statistics {
-  uint64_t sent;     /* calls handed to the daemon */
-  uint64_t dropped;  /* calls refused, or given up in the queue, because it was full or nobody listened */
-  uint64_t queued;   /* calls that wait to be written, now */
-  uint64_t replies;  /* answers received */
+  uint64_t sent;       /* calls handed to the daemon */
+  uint64_t dropped;    /* calls refused, or given up in the queue, because it was full or nobody listened */
+  uint64_t queued;     /* calls that wait to be written, now */
+  uint64_t replies;    /* answers received */
   uint64_t unanswered; /* calls that ended without an answer */
-  uint64_t dropped_events; /* aggregated copies lost because their callbacks did not keep up (4,096 may wait) */
+  uint64_t
+      dropped_events; /* aggregated copies lost because their callbacks did not keep up (4,096 may wait) */
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
 
-/* Writes out what waits, for at most 2 s, closes the connection, ends calls without an answer with VELTRA_NO_REPLY
- * (their callbacks run before this returns), frees the session. Returns how many calls were lost unwritten. Inside a
- * callback it does nothing and returns 0. No call may start any more once this has been called; waiting calls that are
- * under way end. NULL does nothing. */
+/* Writes out what waits, for at most 2 s, closes the connection, ends calls without an answer with
+ * VELTRA_NO_REPLY (their callbacks run before this returns), frees the session. Returns how many calls were
+ * lost unwritten. Inside a callback it does nothing and returns 0. No call may start any more once this has
+ * been called; waiting calls that are under way end. NULL does nothing. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus

@@ -9,8 +9,9 @@ namespace veltrad {
 
 std::string encodeBase64(std::string_view bytes);
 
-// Characters outside the alphabet (line breaks, blanks, anything else) are skipped. Nothing when what remains is no
-// base64: a lone character in the last group, padding that is missing or too long, or characters after the padding.
+// Characters outside the alphabet (line breaks, blanks, anything else) are skipped. Nothing when what remains
+// is no base64: a lone character in the last group, padding that is missing or too long, or characters after
+// the padding.
 std::optional<std::string> decodeBase64(std::string_view text);
 
 }  // namespace veltrad

@@ -14,7 +14,6 @@
 
 namespace veltrad::client_test {
 
-using namespace fakes;
 using ::testing::Each;
 using ::testing::ElementsAre;
 

@@ -23,7 +23,7 @@ namespace veltrad {
 // Lines that are to come while this lives, as "3 TEXT" with the level first; other warnings and errors fail
 // the test.
 using Lines = std::vector<std::string>;
-struct ExpectedLog : fakes::RecordedLog {
+struct ExpectedLog : RecordedLog {
   explicit ExpectedLog(const Lines& lines) {
     for (const std::string& line : lines) expectLine(Level(line[0] - '0'), line.substr(2));
   }
@@ -46,10 +46,10 @@ struct Configuration {
   }
 
   platform::Root root{"/"};
-  fakes::FakeDeviceProperties properties;
+  FakeDeviceProperties properties;
   DeviceIdentity device{properties};
-  fakes::FakePreferences preferences;
-  fakes::FakeFileStore files;
+  FakePreferences preferences;
+  FakeFileStore files;
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra veltra{files, preferences, root};
   platform::HTTPResult answer = FakeHTTPClient::transportError("Could not resolve host: bags.test");

@@ -78,7 +78,7 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
     const ExpectedLog log(c.warning.empty() ? Lines() : Lines{"4 storebagServerURL: " + path + c.warning});
     Machine machine(c.internal, "veltra_storebag_url", c.preference);
     if (c.deployment) machine.files.put(path, *c.deployment);
-    if (c.deployment == unreadable) machine.files.failReads(path, fakes::FakeFileStore::Kind::noAccess);
+    if (c.deployment == unreadable) machine.files.failReads(path, FakeFileStore::Kind::noAccess);
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
     machine.preferences.set("veltra_storebag_url", "https://later.test");
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);

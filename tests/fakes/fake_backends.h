@@ -10,7 +10,7 @@
 #include "backends/backend_factory.h"
 #include "fakes/fake_random.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeBackend final : public VeltraBackend {
  public:
@@ -72,4 +72,4 @@ class FakeBackendFactory final : public BackendFactory {
   FakeRandom _random;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -6,7 +6,7 @@
 
 #include "platform/clock.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeClock final : public platform::Clock {
  public:
@@ -23,4 +23,4 @@ class FakeClock final : public platform::Clock {
   std::atomic<std::int64_t> _microseconds{0};
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

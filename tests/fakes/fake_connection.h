@@ -11,7 +11,7 @@
 
 #include "protocol/connection.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeConnection final : public Connection {
  public:
@@ -63,4 +63,4 @@ class FakeConnection final : public Connection {
   std::function<void()> _invalidation;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -10,7 +10,7 @@
 
 #include "platform/device_properties.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeDeviceProperties final : public platform::DeviceProperties {
  public:
@@ -45,4 +45,4 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
   };
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -10,7 +10,7 @@
 
 #include "platform/file_store.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeFileStore final : public platform::FileStore {
  public:
@@ -107,4 +107,4 @@ class FakeFileStore final : public platform::FileStore {
   std::uint64_t _lastStamp = 0;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -6,7 +6,7 @@
 
 #include "platform/locale.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeLocale final : public platform::Locale {
  public:
@@ -17,4 +17,4 @@ class FakeLocale final : public platform::Locale {
   int offset = 3'600;  // seconds east of GMT
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -10,7 +10,7 @@
 
 #include "platform/preferences.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakePreferences final : public platform::Preferences {
  public:
@@ -50,4 +50,4 @@ class FakePreferences final : public platform::Preferences {
   std::map<Name, Value> _values;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -7,7 +7,7 @@
 
 #include "platform/random.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeRandom final : public platform::Random {
  public:
@@ -26,4 +26,4 @@ class FakeRandom final : public platform::Random {
   std::size_t _next = 0;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

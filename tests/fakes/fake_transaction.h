@@ -7,7 +7,7 @@
 
 #include "platform/transaction.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class FakeTransaction final : public platform::Transaction {
  public:
@@ -27,4 +27,4 @@ class FakeTransaction final : public platform::Transaction {
   std::atomic<int> _opened{0};
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

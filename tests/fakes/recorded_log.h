@@ -13,7 +13,7 @@
 
 #include "platform/log.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 // Everything is kept, debug lines included. Verdict in the destructor: every expected line came, and every
 // warning or error was expected.
@@ -80,4 +80,4 @@ class RecordedLog {
   std::vector<Line> _expected;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -11,7 +11,7 @@
 #include <string_view>
 #include <vector>
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 class TemporaryDirectory {
  public:
@@ -48,4 +48,4 @@ class TemporaryDirectory {
   std::string _path;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -24,7 +24,7 @@
 #include "platform/file_descriptor.h"
 #include "platform/root.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 using ipc::FrameKind;
 inline constexpr std::chrono::seconds kPatience{20};
@@ -185,4 +185,4 @@ class WireEnd {
   bool _ended = false;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

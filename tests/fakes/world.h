@@ -16,7 +16,7 @@
 #include "protocol/veltra.h"
 #include "support/device_identity.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 struct World {
   // What a test left unanswered ends well, while everything that it touches is still there.
@@ -42,4 +42,4 @@ struct World {
   void consent() { preferences.set("DiagnosticLogSubmissionEnabled", true); }
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

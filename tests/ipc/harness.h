@@ -13,7 +13,6 @@ namespace veltrad::ipc_test {
 
 using namespace std::chrono_literals;
 using ::testing::HasSubstr;
-using namespace fakes;
 
 inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
 inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
@@ -152,13 +151,13 @@ class Door : public ListenerDelegate {
   std::size_t stop(std::chrono::milliseconds time = kPatience) { return _listener->invalidate(within(time)); }
 
   const TemporaryRoot root;
-  fakes::RecordedLog log;
+  RecordedLog log;
   platform::Counters counters;
   Journal journal;
   RecordingSession::OnMessage onMessage;  // given to each session made afterwards
 
  private:
-  fakes::FakeFileStore _files;
+  FakeFileStore _files;
   platform::Entitlements _entitlements;
   std::mutex _mutex;
   std::weak_ptr<Connection> _latest;

@@ -12,7 +12,7 @@
 
 #include "platform/file_descriptor.h"
 
-namespace veltrad::inline fakes {
+namespace veltrad {
 
 // The child says what it found, a line at a time; `body` is its whole life.
 class ChildProcess {
@@ -46,4 +46,4 @@ class ChildProcess {
   std::string said;
 };
 
-}  // namespace veltrad::inline fakes
+}  // namespace veltrad

@@ -20,8 +20,8 @@ class MachinePropertiesTest : public ::testing::Test {
  protected:
   void put(const Dictionary& list) { _files.put(kList, writeXMLPropertyList(list)); }
 
-  fakes::RecordedLog _log;
-  fakes::FakeFileStore _files;
+  RecordedLog _log;
+  FakeFileStore _files;
   MachineProperties _properties{_files, kList};
 };
 
@@ -130,7 +130,7 @@ class EnvironmentLocaleTest : public ::testing::Test {
     ::unsetenv("TZ");
     ::tzset();
   }
-  fakes::FakeFileStore _files;
+  FakeFileStore _files;
   EnvironmentLocale _locale{_files, "/root/etc/locale.conf"};
 };
 

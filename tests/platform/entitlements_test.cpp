@@ -70,8 +70,8 @@ class EntitlementsTest : public ::testing::Test {
   }
   void put(const Array& rules) { _files.put(kPath, writeXMLPropertyList(rules)); }
 
-  fakes::RecordedLog _log;
-  fakes::FakeFileStore _files;
+  RecordedLog _log;
+  FakeFileStore _files;
   Entitlements _entitlements{_files, kPath};
 };
 
@@ -124,7 +124,7 @@ TEST(SystemUnit, IsTheFirstBelowTheSlicesAndNeverAUsers) {
 }
 
 TEST(PeerOfSocket, SaysWhoConnectedAndGivesTheDeadNoUnit) {
-  const fakes::TemporaryDirectory directory;
+  const TemporaryDirectory directory;
   sockaddr_un address{AF_UNIX, {}};
   directory.path("s").copy(address.sun_path, sizeof address.sun_path - 1);
   const FileDescriptor listening(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));

@@ -21,7 +21,7 @@ constexpr std::size_t kMost = 1u << 20;
 
 class DiskFileStoreTest : public ::testing::Test {
  protected:
-  fakes::TemporaryDirectory _directory;
+  TemporaryDirectory _directory;
   DiskFileStore _files;
 };
 

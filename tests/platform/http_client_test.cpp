@@ -54,7 +54,7 @@ class HTTPClientTest : public testing::Test {
   const TestCertificates certificates;
   TLSServer hung{certificates, always(kSilent)};
   TLSServer healthy{certificates, always(kOK)};
-  const fakes::TemporaryDirectory place;
+  const TemporaryDirectory place;
   CurlHTTPClient client{{place.path("ca.pem")}};
 };
 

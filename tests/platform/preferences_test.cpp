@@ -26,8 +26,8 @@ class FilePreferencesTest : public ::testing::Test {
  protected:
   void put(const Dictionary& all) { _files.put(kPath, writeBinaryPropertyList(all)); }
 
-  fakes::RecordedLog _log;
-  fakes::FakeFileStore _files;
+  RecordedLog _log;
+  FakeFileStore _files;
   FilePreferences _preferences{_files, "/preferences"};
 };
 
@@ -95,8 +95,8 @@ TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
 }
 
 TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
-  fakes::RecordedLog log;
-  fakes::TemporaryDirectory directory;
+  RecordedLog log;
+  TemporaryDirectory directory;
   DiskFileStore files;
   FilePreferences preferences(files, directory.path());
   std::vector<std::string> texts(4);

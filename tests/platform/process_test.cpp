@@ -58,7 +58,7 @@ int errorOf(int result) {
 
 TEST(Sandbox, LeavesWhatTheProfileNamesAndTheNetwork) {
   if (landlock::abi() == 0) GTEST_SKIP() << "this kernel has no Landlock";
-  const fakes::TemporaryDirectory directory;
+  const TemporaryDirectory directory;
   const auto path = [&](std::string_view name) { return directory.path(name); };
   for (const char* name : {"r", "w", "w/below", "other"}) std::filesystem::create_directory(path(name));
   for (const char* name : {"r/x", "w/x", "other/x", "file"}) directory.write(name, "x");
@@ -134,7 +134,7 @@ int boundSocket(const std::string& path, int type) {
 }
 
 TEST(ServiceManager, IsToldOneThingAtATime) {
-  const fakes::TemporaryDirectory directory;
+  const TemporaryDirectory directory;
   const FileDescriptor socket(boundSocket(directory.path("notify"), SOCK_DGRAM));
   ::setenv("NOTIFY_SOCKET", directory.path("notify").c_str(), 1);
   ServiceManager manager;
@@ -169,7 +169,7 @@ TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
                {"1", SOCK_DGRAM, "the handed-over descriptor is no listening Unix stream socket\n"},
                {"2", SOCK_STREAM, "expected one handed-over socket, got 2\n"}};
   for (const auto& c : cases) {
-    const fakes::TemporaryDirectory directory;
+    const TemporaryDirectory directory;
     const ChildProcess child([&](const auto& say) {
       const int socket = boundSocket(directory.path("s"), c.type);
       for (const int handed : {3, 4}) ::dup2(socket, handed);
@@ -187,8 +187,8 @@ TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
 // ---- counters, draws, names
 
 TEST(Counters, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
-  fakes::RecordedLog log;
-  fakes::FakeFileStore files;
+  RecordedLog log;
+  FakeFileStore files;
   Counters counters;
   counters.count("message dropped: the queue is full");
   counters.count("message dropped: the queue is full", 41);

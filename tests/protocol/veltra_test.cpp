@@ -16,9 +16,9 @@ namespace {
 
 class VeltraTest : public ::testing::Test {
  protected:
-  fakes::RecordedLog _log;
-  fakes::FakeFileStore _files;
-  fakes::FakePreferences _preferences;
+  RecordedLog _log;
+  FakeFileStore _files;
+  FakePreferences _preferences;
   Veltra _veltra{_files, _preferences, platform::Root("/r")};
 };
 

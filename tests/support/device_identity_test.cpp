@@ -20,7 +20,7 @@ TEST(DeviceIdentity, AsksTheServiceAnewUnderItsKeys) {
       {"DeviceName", &DeviceIdentity::deviceName},
       {"HWModelStr", &DeviceIdentity::deviceHardwareModel},
       {"SerialNumber", &DeviceIdentity::deviceSerialNumber}};
-  fakes::FakeDeviceProperties service;
+  FakeDeviceProperties service;
   service.clear();
   DeviceIdentity device(service);
   for (const auto& [key, operation] : operations) {
@@ -33,7 +33,7 @@ TEST(DeviceIdentity, AsksTheServiceAnewUnderItsKeys) {
 }
 
 TEST(DeviceIdentity, CopiesAUniqueIdOnlyWhereItFits) {
-  fakes::FakeDeviceProperties service;
+  FakeDeviceProperties service;
   DeviceIdentity device(service);
   const std::string before(41, 'z');
   for (const std::size_t length : {1u, 40u, 41u, 100u}) {
@@ -51,7 +51,7 @@ TEST(DeviceIdentity, CopiesAUniqueIdOnlyWhereItFits) {
 TEST(DeviceIdentity, IsInternalByTheExactWordOnce) {
   const char* const absent = nullptr;
   for (const char* releaseType : {"Internal", "internal", "Internal ", "", absent}) {
-    fakes::FakeDeviceProperties service;
+    FakeDeviceProperties service;
     if (releaseType) service.set("ReleaseType", releaseType);
     DeviceIdentity device(service);
     const bool internal = releaseType && std::string(releaseType) == "Internal";

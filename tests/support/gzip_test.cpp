@@ -28,7 +28,7 @@ std::string inflated(const std::string& compressed, std::size_t length, int wind
 }
 
 TEST(Gzip, GivesBackWhatWentIn) {
-  fakes::RecordedLog log;
+  RecordedLog log;
   std::mt19937 random(7);
   std::string noise(3u << 20, '\0');  // does not shrink: needs the whole bound
   for (char& c : noise) c = static_cast<char>(random());

@@ -31,9 +31,9 @@ class MessageLogTest : public ::testing::Test {
 
   const std::int64_t _now = ::time(nullptr);
   const std::string _line = dateAt(_now) + "[b -> text\n";
-  fakes::RecordedLog _log;
-  fakes::TemporaryDirectory _place;
-  fakes::FakeClock _clock{{_now, 900'000}};
+  RecordedLog _log;
+  TemporaryDirectory _place;
+  FakeClock _clock{{_now, 900'000}};
   MessageLogFile _messages{_clock, _place.path()};
   const std::string _current = _place.path(nameAt(_now));
 };

@@ -41,7 +41,7 @@ class StorebagCommands : public testing::Test {
   }
 
  private:
-  fakes::TemporaryDirectory _directory;
+  TemporaryDirectory _directory;
 
  protected:
   const std::string privateKey = path("keys/privateKey.pem"), publicKey = path("keys/publicKey.der");
