@@ -12,7 +12,8 @@ int main(void) {
   veltra_reply* reply = NULL;
   veltra_session_start(session, NULL, NULL);
   veltra_status status = veltra_session_send_wait(session, 5, 1, NULL, 0, &reply);
-  const char* text = status == VELTRA_OK ? veltra_reply_text(reply, NULL) : veltra_reply_error_description(reply);
+  const char* text =
+      status == VELTRA_OK ? veltra_reply_text(reply, NULL) : veltra_reply_error_description(reply);
   puts(text ? text : "The daemon took the message.");
   return veltra_reply_release(reply), (int)veltra_session_close(session) + (status != VELTRA_OK);
 }
