@@ -11,7 +11,7 @@ int main(void) {
   if (!session) return fprintf(stderr, "%s\n", error), veltra_free(error), 1;
   veltra_reply* reply = NULL;
   veltra_session_start(session, NULL, NULL);
-  veltra_status status = veltra_session_send_wait(session, 5, 1, NULL, 0, &reply);
+  veltra_status status = veltra_session_send_wait(session, 5, 10, NULL, 0, &reply);
   const char* text =
       status == VELTRA_OK ? veltra_reply_text(reply, NULL) : veltra_reply_error_description(reply);
   puts(text ? text : "The daemon took the message.");

@@ -68,7 +68,7 @@ def main():
     results = daemon.ask(
         "sendMessageWithCategory:type:payload:reply:",
         category=5,
-        type=1,
+        type=10,
         payload={"greeting": "Hello, veltrad"},
     )
     print(results.get("reply", "(no text)"))

@@ -22,6 +22,10 @@ constexpr auto kTick = 1000ms;    // counters are written and the watchdog is fe
 
 // What is written to later must be there before the sandbox closes.
 bool makeDirectories(const platform::Root& root) {
+  // Not written to, but what an administrator puts there later must be readable then: only what is there now
+  // can be let through the sandbox. Where it cannot be made, the file system says that nobody puts anything
+  // there.
+  static_cast<void>(platform::makeDirectories(root.configurationDirectory()));
   const std::string messageLog = root.messageLogDirectory();
   for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory(), root.logsDirectory(),
                                        messageLog.substr(0, messageLog.rfind('/'))}) {

@@ -28,7 +28,6 @@ bool VeltradAgent::listener(Listener&, const std::shared_ptr<Connection>& connec
     logDebug(
         "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
         connection->description().c_str());
-    _services.counters.count("connection refused: no entitlement");
     return false;
   }
   logDebug("listener: Accepting new Vopex connection %s as it has proper entitlement, %d(%d) connections.",

@@ -32,13 +32,13 @@ Parsed parsed(const std::string& line) {
 
 TEST(Options, sessionSaysWhoTheClientIs) {
   const Options options = parsed<Options>(
-      "--root /r session --client-type 17 --session-id 4294967295 --client-version 65535 --client 123 "
+      "--root /r session --client-type=-17 --session-id 4294967295 --client-version 65535 --client 123 "
       "--service ringer --user-info build=7 region=EU --require-user-info --batch-events --aggregate "
       "--input lines.jsonl");
   EXPECT_EQ(options.command, Command::session);
   EXPECT_EQ(options.root, "/r");
   EXPECT_EQ(options.input, "lines.jsonl");
-  EXPECT_EQ(options.identity.clientType, 17);
+  EXPECT_EQ(options.identity.clientType, -17);
   EXPECT_EQ(options.identity.sessionID, 4294967295u);
   EXPECT_EQ(options.identity.clientVersion, 65535);
   EXPECT_TRUE(options.identity.requireUserInfo && options.identity.batchEvents && options.aggregate);
@@ -80,9 +80,10 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
       {"--explode", "unknown option \"--explode\""},
       {"session stats", "\"stats\" is not expected here"},
       {"states --aggregate", "\"--aggregate\" is not expected here"},
-      {"session --client-type 18", "--client-type: expected an integer from 0 to 17, found \"18\""},
-      {"session --client-type 0x7", "from 0 to 17, found \"0x7\""},
-      {"session --client-type=-1", "from 0 to 17, found \"-1\""},
+      {"session --client-type 2147483648", "from -2147483648 to 2147483647, found \"2147483648\""},
+      {"session --client-type 0x7",
+       "--client-type: expected an integer from -2147483648 to 2147483647, found"},
+      {"session --session-id=-1", "from 0 to 4294967295, found \"-1\""},
       {"session --session-id 4294967296", "from 0 to 4294967295, found \"4294967296\""},
       {"session --client-version 65536", "from 0 to 65535, found \"65536\""},
       {"session --user-info novalue", "\"novalue\": expected KEY=VALUE"},

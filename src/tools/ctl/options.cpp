@@ -40,12 +40,13 @@ std::string textProblem(const std::string& text) {
 template <typename T, typename Target>
 CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, T most,
                        const std::string& help) {
-  const auto read = [name, &target, most](const std::string& text) {
+  const T least = std::numeric_limits<T>::min();
+  const auto read = [name, &target, least, most](const std::string& text) {
     T number = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (error != std::errc() || end != text.data() + text.size() || number > most || text[0] == '-') {
-      throw CLI::ValidationError(
-          name, fmt::format("expected an integer from 0 to {}, found \"{}\"", most, escapedForLog(text)));
+    if (error != std::errc() || end != text.data() + text.size() || number > most) {
+      throw CLI::ValidationError(name, fmt::format("expected an integer from {} to {}, found \"{}\"", least,
+                                                   most, escapedForLog(text)));
     }
     target = number;
   };
@@ -63,7 +64,8 @@ void addText(CLI::App& app, const std::string& name, std::optional<std::string>&
 // `oneEach`: the words after the option belong to the command itself.
 void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) {
   const char* group = "Identity";
-  addNumber<std::int32_t>(app, "--client-type", identity.clientType, 17, "Chooses what is reported, 0 to 17")
+  addNumber<std::int32_t>(app, "--client-type", identity.clientType, std::numeric_limits<std::int32_t>::max(),
+                          "Chooses what is reported: 0 to 17 are defined")
       ->group(group);
   addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, std::numeric_limits<std::uint32_t>::max(),
                            "The client's own number for this session")

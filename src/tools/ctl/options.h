@@ -12,7 +12,7 @@ namespace veltrad::ctl {
 
 // What a session says of itself; what is absent is left out of its session info.
 struct Identity {
-  std::optional<std::int32_t> clientType;  // 0 to 17
+  std::optional<std::int32_t> clientType;  // 0 to 17 are defined; the daemon takes any
   std::optional<std::uint32_t> sessionID;
   std::optional<std::uint16_t> clientVersion;
   bool requireUserInfo = false;
