@@ -127,9 +127,17 @@ void CurlTransfer::setBody(CURL* easy) {
     _curl->easySetopt(easy, CURLOPT_HTTPGET, 1L);
     return;
   }
+  _curl->easySetopt(easy, CURLOPT_PREREQFUNCTION, beforeRequest);
+  _curl->easySetopt(easy, CURLOPT_PREREQDATA, this);
   _curl->easySetopt(easy, CURLOPT_POST, 1L);
   _curl->easySetopt(easy, CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_request.body.size()));
   _curl->easySetopt(easy, CURLOPT_POSTFIELDS, _request.body.data());  // not copied
+}
+
+// libcurl sends a request again when a kept connection ends without a byte; the server may have read it all
+// the same, and a post is never sent twice.
+int CurlTransfer::beforeRequest(void* self, char*, char*, int, int) {
+  return static_cast<CurlTransfer*>(self)->_attempts++ == 0 ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
 }
 
 void CurlTransfer::setLimits(CURL* easy, Time now) {
@@ -201,6 +209,7 @@ std::string CurlTransfer::describe(CURLcode code) const {
   if (_received > _request.mostResponseBytes) {
     return "The answer is larger than " + std::to_string(_request.mostResponseBytes) + " bytes";
   }
+  if (_attempts > 1) return "Empty reply from server";  // as libcurl says on a new connection
   std::string text = _error[0] != '\0' ? _error.data() : _curl->easyStrerror(code);
   while (!text.empty() && isControl(text.back())) text.pop_back();
   std::replace_if(text.begin(), text.end(), isControl, ' ');

@@ -58,6 +58,7 @@ class CurlTransfer {
   bool admits(std::size_t more);
   std::string describe(CURLcode code) const;
 
+  static int beforeRequest(void* self, char*, char*, int, int);
   static std::size_t takeBody(char* bytes, std::size_t size, std::size_t count, void* self);
   static std::size_t takeHeader(char* bytes, std::size_t size, std::size_t count, void* self);
 
@@ -73,6 +74,7 @@ class CurlTransfer {
   HeaderList _headerList{nullptr, nullptr};
   std::array<char, CURL_ERROR_SIZE> _error{};
   std::string _body;
+  int _attempts = 0;          // how often libcurl was about to send the request
   std::size_t _received = 0;  // header and body bytes
   std::size_t _headerBytes = 0;
 };

@@ -80,6 +80,7 @@ struct TLSAnswer {
   enum class Shape {
     whole,
     cut,          // "Content-Length" is the body's, half of it comes, then the end
+    hangUp,       // the end, without a byte
     silent,       // nothing until the server ends
     endless,      // a chunked body without end
     endlessHead,  // headers without end
@@ -238,6 +239,8 @@ class TLSServer {
         return write(tls, whole);
       case Shape::cut:
         write(tls, whole.substr(0, whole.size() - answer.body.size() / 2));
+        return false;
+      case Shape::hangUp:
         return false;
       case Shape::silent: {
         std::unique_lock lock(_mutex);

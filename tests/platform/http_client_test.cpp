@@ -137,6 +137,18 @@ TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
   }
 }
 
+TEST_F(HTTPClientTest, APostIsNeverSentTwice) {
+  std::atomic<int> asked{0};
+  TLSServer server(certificates, [&](const TLSRequest&) {
+    return ++asked == 1 ? TLSAnswer{} : TLSAnswer{200, {}, "", Shape::hangUp};
+  });
+  ASSERT_TRUE(client.perform(post(server.url(), "kept alive")).ok());
+  for (const char* connection : {"kept", "new"}) {
+    EXPECT_TRANSPORT_ERROR(client.perform(post(server.url(), connection)), "Empty reply from server");
+  }
+  EXPECT_EQ(server.requests().size(), 3u);
+}
+
 TEST_F(HTTPClientTest, UnreachableServersAreTransportErrors) {
   const std::string refused = TLSServer(certificates, always({})).url();
   EXPECT_TRANSPORT_ERROR(client.perform(get(refused)), HasSubstr("connect"));
