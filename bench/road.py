@@ -34,6 +34,24 @@ def start_milliseconds(root):
     return daemon, ready
 
 
+def memory_of_sessions(root):
+    """A fresh daemon's memory after its first posts, and what each further session with one back end adds."""
+    daemon = Daemon(root, env={"VELTRA_LOG": "info"})
+    command = [program("veltractl"), "--root", str(root.path), "session", "--client-type", "6"]
+    clients = []
+    for _ in range(1 + SESSIONS):
+        clients.append(subprocess.Popen(command, stdin=subprocess.PIPE, stdout=subprocess.PIPE))
+        clients[-1].stdout.readline()
+        if len(clients) == 1:
+            wait_until(lambda: "event posted" in (root.path / "run/veltrad/counters.json").read_text(), "a first post")
+            first = memory_kib(daemon.popen.pid)
+    grown = memory_kib(daemon.popen.pid) - first
+    for client in clients:
+        client.communicate()
+    daemon.stop()
+    return {"afterFirstPostKiB": first, "kibASession": round(grown / SESSIONS, 1)}
+
+
 def main():
     if os.environ.get("VELTRA_PIN"):
         os.sched_setaffinity(0, {0})
@@ -49,15 +67,8 @@ def main():
         figures.update(json.loads(done.stdout))
         messages = figures["roundTrips"] + figures["oneWay"]
         figures["daemonMicrosecondsAMessage"] = round((cpu_seconds(daemon.popen.pid) - before) / messages * 1e6, 2)
-        figures["afterPostsKiB"] = memory_kib(daemon.popen.pid)
-        clients = [subprocess.Popen([program("veltractl"), "--root", str(root.path), "session", "--client-type", "6"],
-                                    stdin=subprocess.PIPE, stdout=subprocess.PIPE) for _ in range(SESSIONS)]
-        for client in clients:
-            client.stdout.readline()
-        figures["kibASession"] = round((memory_kib(daemon.popen.pid) - figures["afterPostsKiB"]) / SESSIONS, 1)
-        for client in clients:
-            client.communicate()
         daemon.stop()
+        figures.update(memory_of_sessions(root))
         print(json.dumps(figures, indent=2))
     finally:
         lab.stop()
