@@ -175,9 +175,16 @@ TEST_F(HTTPSPost, OnlyA5xxDisables) {
   EXPECT_EQ(world.counters.value("event posted"), 4u);
   EXPECT_EQ(world.counters.value("event lost: the server answered 5xx"), 2u);
   const auto backend = make({entry()});
-  log.expectLine(RecordedLog::Level::error, "HTTPSPostBackend(postJsonMessage): post error: cut");
-  backend->sendMessage(nullptr, kEvent, 5, 2, 0);
-  ASSERT_TRUE(world.http.answerNext(FakeHTTPClient::transportError("cut")));
+  using Kind = platform::HTTPError::Kind;
+  for (const auto& [kind, reason] :
+       {std::pair{Kind::transport, "event lost: the post failed"},
+        {Kind::tooMany, "event lost: too many posts under way"},
+        {Kind::stopping, "event lost: the daemon stopped before the post ended"}}) {
+    log.expectLine(RecordedLog::Level::error, "HTTPSPostBackend(postJsonMessage): post error: cut");
+    backend->sendMessage(nullptr, kEvent, 5, 2, 0);
+    ASSERT_TRUE(world.http.answerNext(FakeHTTPClient::error(kind, "cut")));
+    EXPECT_EQ(world.counters.value(reason), 1u) << reason;
+  }
   EXPECT_EQ(backend->state(), kBackendReporting);
 }
 
@@ -280,6 +287,13 @@ TEST_F(HTTPSPost, ABatchWithoutEndIsBounded) {
   for (int i = 0; i < 5000; ++i) held->sendMessage(nullptr, kEvent, 5, 2, 0);
   EXPECT_EQ(world.counters.value("event dropped: the batch is full"), 5000 - EventBatch::kMostEvents);
   EXPECT_TRUE(world.http.pending().empty());
+}
+
+TEST_F(HTTPSPost, WhatIsStillBatchedAtTheEndIsCounted) {
+  auto backend = make({entry()}, {}, false, true);
+  for (std::uint16_t method = 5; method < 8; ++method) backend->sendMessage(nullptr, kEvent, method, 2, 0);
+  backend.reset();
+  EXPECT_EQ(world.counters.value("event dropped: its back end ended before a flush"), 3u);
 }
 
 TEST_F(HTTPSPost, PreferencesReplaceURLsAndIdentifiersPersist) {

@@ -54,7 +54,6 @@ struct Configuration {
   Veltra veltra{files, preferences, root};
   platform::HTTPResult answer = FakeHTTPClient::transportError("Could not resolve host: bags.test");
   std::vector<platform::HTTPRequest> requests;  // those that were answered
-  // Last, so that its thread ends first.
   FakeHTTPClient client{[this](const platform::HTTPRequest& request) {
     requests.push_back(request);
     return answer;

@@ -16,6 +16,18 @@ namespace veltrad {
 namespace {
 constexpr std::uint16_t kSessionTypeStop = 1;
 
+const char* reasonOf(platform::HTTPError::Kind kind) {
+  switch (kind) {
+    case platform::HTTPError::Kind::transport:
+      return "event lost: the post failed";
+    case platform::HTTPError::Kind::tooMany:
+      return "event lost: too many posts under way";
+    case platform::HTTPError::Kind::stopping:
+      return "event lost: the daemon stopped before the post ended";
+  }
+  return "event lost: the post failed";
+}
+
 bool meansRealtime(std::int32_t flag) {
   return flag == 1 || flag == 3;
 }
@@ -23,6 +35,13 @@ bool meansSamplingOverride(std::int32_t flag) {
   return flag == 2 || flag == 3;
 }
 }  // namespace
+
+HTTPSPostBackend::~HTTPSPostBackend() {
+  const Lock held(_batchMutex);
+  if (_batch.size() > 0) {
+    _services.counters.count("event dropped: its back end ended before a flush", _batch.size());
+  }
+}
 
 std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* payload,
                                                          platform::TimeValue timestamp, std::uint16_t method,
@@ -248,7 +267,7 @@ void HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result, std::siz
   } else {
     logError("HTTPSPostBackend(postJsonMessage): post error: %s", result.error().description.c_str());
     error = makeReportingError(result.error().description, -1);
-    _services.counters.count("event lost: the post failed", eventCount);
+    _services.counters.count(reasonOf(result.error().kind), eventCount);
   }
   const PostVerdict verdict = verdictOfStatus(status);
   if (verdict.disablesBackend) {

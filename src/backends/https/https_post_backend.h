@@ -22,6 +22,9 @@ class HTTPSPostBackend final : public VeltraBackend {
                                                         const std::string& name, const Dictionary* profile,
                                                         const std::optional<std::string>& productFamily);
 
+  // Counts the events that were still batched: a second start, or user info that never came, lets them go.
+  ~HTTPSPostBackend() override;
+
   void updateState() override;
   using VeltraBackend::sendMessage;
   std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
