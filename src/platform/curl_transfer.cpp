@@ -2,7 +2,6 @@
 #include "platform/curl_transfer.h"
 
 #include <openssl/ssl.h>
-#include <sys/socket.h>
 
 #include <algorithm>
 #include <array>
@@ -49,10 +48,6 @@ std::string hostOf(std::string_view url) {
   return std::string(url.substr(0, url.find_first_of("/?#")));
 }
 
-curl_socket_t openSocket(void*, curlsocktype, curl_sockaddr* address) {
-  return socket(address->family, address->socktype | SOCK_CLOEXEC, address->protocol);
-}
-
 CURLcode setStore(CURL*, void* context, void* trust) {
   X509_STORE* store = static_cast<TrustStore*>(trust)->current();
   if (store == nullptr) return CURLE_OUT_OF_MEMORY;
@@ -76,8 +71,10 @@ void CurlTransfer::refuse(HTTPError error) {
   std::string().swap(_request.body);
 }
 
-bool CurlTransfer::attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust, Time now) {
+bool CurlTransfer::attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust,
+                          KeptConnections& connections, Time now) {
   _curl = &curl;
+  _connections = &connections;
   if (_curl->easySetopt(easy, CURLOPT_URL, _request.url.c_str()) != CURLE_OK || !setHeaders(easy))
     return false;
   _curl->easySetopt(easy, CURLOPT_PROTOCOLS_STR, "https");
@@ -88,6 +85,12 @@ bool CurlTransfer::attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust
   _curl->easySetopt(easy, CURLOPT_NOSIGNAL, 1L);
   _curl->easySetopt(easy, CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
   _curl->easySetopt(easy, CURLOPT_OPENSOCKETFUNCTION, openSocket);
+  _curl->easySetopt(easy, CURLOPT_OPENSOCKETDATA, this);
+  _curl->easySetopt(easy, CURLOPT_CLOSESOCKETFUNCTION, KeptConnections::close);
+  _curl->easySetopt(easy, CURLOPT_CLOSESOCKETDATA, _connections);
+  _curl->easySetopt(easy, CURLOPT_FRESH_CONNECT, metEndedConnection() ? 1L : 0L);
+  _connection = Connection::kept;
+  _error[0] = '\0';
   _curl->easySetopt(easy, CURLOPT_ERRORBUFFER, _error.data());
   _curl->easySetopt(easy, CURLOPT_WRITEFUNCTION, takeBody);
   _curl->easySetopt(easy, CURLOPT_WRITEDATA, this);
@@ -100,6 +103,7 @@ bool CurlTransfer::attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust
 }
 
 bool CurlTransfer::setHeaders(CURL* easy) {
+  _headerList = HeaderList(nullptr, _curl->slistFreeAll);
   // What libcurl would add by itself, unless the request has its own.
   std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
   const auto append = [this](const std::string& line) {
@@ -134,10 +138,23 @@ void CurlTransfer::setBody(CURL* easy) {
   _curl->easySetopt(easy, CURLOPT_POSTFIELDS, _request.body.data());  // not copied
 }
 
-// libcurl sends a request again when a kept connection ends without a byte; the server may have read it all
-// the same, and a post is never sent twice.
-int CurlTransfer::beforeRequest(void* self, char*, char*, int, int) {
-  return static_cast<CurlTransfer*>(self)->_attempts++ == 0 ? CURL_PREREQFUNC_OK : CURL_PREREQFUNC_ABORT;
+curl_socket_t CurlTransfer::openSocket(void* self, curlsocktype, curl_sockaddr* address) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  transfer._connection = Connection::own;
+  return transfer._connections->open(*address);
+}
+
+// Not on a kept connection that has ended. And not again: libcurl repeats a request when a kept connection
+// ends without a byte; the server may have read it all the same, and a post is never sent twice.
+int CurlTransfer::beforeRequest(void* self, char*, char*, int, int localPort) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  if (transfer._attempts > 0) return CURL_PREREQFUNC_ABORT;
+  if (transfer._connection == Connection::kept && transfer._connections->ended(localPort)) {
+    transfer._connection = Connection::ended;
+    return CURL_PREREQFUNC_ABORT;
+  }
+  ++transfer._attempts;
+  return CURL_PREREQFUNC_OK;
 }
 
 void CurlTransfer::setLimits(CURL* easy, Time now) {
@@ -209,7 +226,8 @@ std::string CurlTransfer::describe(CURLcode code) const {
   if (_received > _request.mostResponseBytes) {
     return "The answer is larger than " + std::to_string(_request.mostResponseBytes) + " bytes";
   }
-  if (_attempts > 1) return "Empty reply from server";  // as libcurl says on a new connection
+  if (code == CURLE_ABORTED_BY_CALLBACK)
+    return "Empty reply from server";  // as libcurl says on a new connection
   std::string text = _error[0] != '\0' ? _error.data() : _curl->easyStrerror(code);
   while (!text.empty() && isControl(text.back())) text.pop_back();
   std::replace_if(text.begin(), text.end(), isControl, ' ');

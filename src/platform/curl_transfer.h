@@ -12,12 +12,13 @@
 
 #include "platform/curl_library.h"
 #include "platform/http_client.h"
+#include "platform/kept_connections.h"
 #include "platform/trust_store.h"
 
 namespace veltrad::platform {
 
-// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `trust` must
-// live.
+// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `trust` and
+// `connections` must live.
 class CurlTransfer {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -39,7 +40,10 @@ class CurlTransfer {
   const std::optional<HTTPError>& refused() const { return _refused; }
 
   // Sets `easy` up, which is fresh or reset. False: libcurl has no memory for it.
-  bool attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust, Time now);
+  bool attach(const CurlLibrary& curl, CURL* easy, TrustStore& trust, KeptConnections& connections, Time now);
+  // The kept connection that libcurl chose had ended, so nothing was sent: attach again, once; it then gets a
+  // new one.
+  bool metEndedConnection() const { return _connection == Connection::ended; }
   // What libcurl's verdict means; reads the attached handle.
   HTTPResult result(CURLcode code, CURL* easy);
   HTTPError timedOutWaiting() const;
@@ -49,6 +53,7 @@ class CurlTransfer {
   void complete(HTTPResult result);
 
  private:
+  enum class Connection { kept, ended, own };  // as far as is known: `own` once it has opened one
   using HeaderList = std::unique_ptr<curl_slist, decltype(&::curl_slist_free_all)>;
 
   bool setHeaders(CURL* easy);
@@ -58,7 +63,8 @@ class CurlTransfer {
   bool admits(std::size_t more);
   std::string describe(CURLcode code) const;
 
-  static int beforeRequest(void* self, char*, char*, int, int);
+  static curl_socket_t openSocket(void* self, curlsocktype, curl_sockaddr* address);
+  static int beforeRequest(void* self, char*, char*, int, int localPort);
   static std::size_t takeBody(char* bytes, std::size_t size, std::size_t count, void* self);
   static std::size_t takeHeader(char* bytes, std::size_t size, std::size_t count, void* self);
 
@@ -71,6 +77,8 @@ class CurlTransfer {
   std::optional<HTTPError> _refused;
 
   const CurlLibrary* _curl = nullptr;
+  KeptConnections* _connections = nullptr;
+  Connection _connection = Connection::kept;
   HeaderList _headerList{nullptr, nullptr};
   std::array<char, CURL_ERROR_SIZE> _error{};
   std::string _body;

@@ -89,7 +89,7 @@ void HTTPWorker::startOne(Transfer transfer) {
   CURL* easy = _idleHandles.empty() ? _curl.easyInit() : _idleHandles.back();
   if (!_idleHandles.empty()) _idleHandles.pop_back();
   const bool ready = easy != nullptr &&
-                     transfer->attach(_curl, easy, _trust, std::chrono::steady_clock::now()) &&
+                     transfer->attach(_curl, easy, _trust, _connections, std::chrono::steady_clock::now()) &&
                      _curl.multiAddHandle(_multi, easy) == CURLM_OK;
   if (ready) {
     _running.emplace(easy, std::move(transfer));
@@ -113,6 +113,10 @@ void HTTPWorker::finish() {
     HTTPResult result = transfer->result(code, easy);
     _curl.multiRemoveHandle(_multi, easy);
     keepHandle(easy);
+    if (code == CURLE_ABORTED_BY_CALLBACK && transfer->metEndedConnection()) {
+      startOne(std::move(transfer));
+      continue;
+    }
     _waiting.ended(*transfer);
     complete(std::move(transfer), std::move(result));
   }

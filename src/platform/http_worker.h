@@ -12,6 +12,7 @@
 #include "platform/curl_transfer.h"
 #include "platform/http_inbox.h"
 #include "platform/http_waiting.h"
+#include "platform/kept_connections.h"
 #include "platform/trust_store.h"
 
 namespace veltrad::platform {
@@ -53,6 +54,7 @@ class HTTPWorker {
   // HTTP thread only
   TrustStore _trust;
   HTTPWaiting _waiting;
+  KeptConnections _connections;
   std::unordered_map<CURL*, Transfer> _running;
   std::vector<CURL*> _idleHandles;  // their set-up costs more than a reset
 };

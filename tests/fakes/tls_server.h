@@ -79,6 +79,7 @@ struct TLSRequest {
 struct TLSAnswer {
   enum class Shape {
     whole,
+    thenCloses,   // whole, without a word that the connection ends; it does
     cut,          // "Content-Length" is the body's, half of it comes, then the end
     hangUp,       // the end, without a byte
     silent,       // nothing until the server ends
@@ -142,6 +143,10 @@ class TLSServer {
     std::unique_lock lock(_mutex);
     return _changed.wait_for(lock, std::chrono::seconds(20), [&] { return _requests.size() >= count; });
   }
+  bool waitForAllClosed() const {
+    std::unique_lock lock(_mutex);
+    return _changed.wait_for(lock, std::chrono::seconds(20), [&] { return _open.empty(); });
+  }
   bool waitForRefusedHandshake() const {
     std::unique_lock lock(_mutex);
     return _changed.wait_for(lock, std::chrono::seconds(20), [&] { return _refusedHandshakes > 0; });
@@ -190,6 +195,7 @@ class TLSServer {
     const std::lock_guard lock(_mutex);
     _open.erase(fd);
     close(fd);
+    _changed.notify_all();
   }
 
   // What a whole request takes out of `received`.
@@ -237,6 +243,10 @@ class TLSServer {
     switch (answer.shape) {
       case Shape::whole:
         return write(tls, whole);
+      case Shape::thenCloses:
+        write(tls, whole);
+        SSL_shutdown(tls);
+        return false;
       case Shape::cut:
         write(tls, whole.substr(0, whole.size() - answer.body.size() / 2));
         return false;

@@ -149,6 +149,16 @@ TEST_F(HTTPClientTest, APostIsNeverSentTwice) {
   EXPECT_EQ(server.requests().size(), 3u);
 }
 
+TEST_F(HTTPClientTest, APostIsNotSentOnAKeptConnectionThatItsServerClosed) {
+  TLSServer server(certificates, always({200, {}, "", TLSAnswer::Shape::thenCloses}));
+  for (std::size_t sent = 1; sent <= 3; ++sent) {
+    EXPECT_TRUE(client.perform(post(server.url(), "x")).ok());
+    ASSERT_TRUE(server.waitForAllClosed());
+    EXPECT_EQ(server.requests().size(), sent);
+    EXPECT_EQ(server.connections(), sent);
+  }
+}
+
 TEST_F(HTTPClientTest, UnreachableServersAreTransportErrors) {
   const std::string refused = TLSServer(certificates, always({})).url();
   EXPECT_TRANSPORT_ERROR(client.perform(get(refused)), HasSubstr("connect"));

@@ -1,0 +1,45 @@
+// The sockets of libcurl's connections.
+#include "platform/kept_connections.h"
+
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+
+namespace veltrad::platform {
+
+namespace {
+int localPortOf(curl_socket_t socket) {
+  sockaddr_storage address{};
+  socklen_t length = sizeof address;
+  if (getsockname(socket, reinterpret_cast<sockaddr*>(&address), &length) != 0) return -1;
+  if (address.ss_family == AF_INET) return ntohs(reinterpret_cast<const sockaddr_in&>(address).sin_port);
+  if (address.ss_family == AF_INET6) return ntohs(reinterpret_cast<const sockaddr_in6&>(address).sin6_port);
+  return -1;
+}
+}  // namespace
+
+curl_socket_t KeptConnections::open(const curl_sockaddr& address) {
+  const curl_socket_t made = socket(address.family, address.socktype | SOCK_CLOEXEC, address.protocol);
+  if (made != CURL_SOCKET_BAD) _sockets.push_back(made);
+  return made;
+}
+
+int KeptConnections::close(void* self, curl_socket_t socket) {
+  auto& sockets = static_cast<KeptConnections*>(self)->_sockets;
+  sockets.erase(std::remove(sockets.begin(), sockets.end(), socket), sockets.end());
+  return ::close(socket);
+}
+
+bool KeptConnections::ended(int localPort) const {
+  const auto found = std::find_if(_sockets.begin(), _sockets.end(),
+                                  [localPort](curl_socket_t s) { return localPortOf(s) == localPort; });
+  if (found == _sockets.end()) return false;
+  char byte = 0;
+  const ssize_t length = recv(*found, &byte, 1, MSG_PEEK | MSG_DONTWAIT);
+  return length >= 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR);
+}
+
+}  // namespace veltrad::platform
