@@ -1,5 +1,5 @@
 // What the device and the locale say of themselves.
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 #include <time.h>
 
 #include <cstdlib>
@@ -50,10 +50,8 @@ TEST_F(MachinePropertiesTest, AMalformedListIsOneLineAChangeAndTheMachineIsAsked
 }
 
 TEST_F(MachinePropertiesTest, AsksDMIThenTheDeviceTree) {
-  for (const char* key : {"ProductVersion", "BuildVersion", "ProductType", "HWModelStr", "SerialNumber",
-                          "UniqueDeviceID", "ReleaseType", "unheard of"})
+  for (const char* key : {"ProductVersion", "ProductType", "UniqueDeviceID", "ReleaseType", "unheard of"})
     EXPECT_EQ(_properties.value(key), Text()) << key;
-  EXPECT_EQ(_properties.value("DeviceName"), "Computer");
   _files.put("/usr/lib/os-release", "VERSION_ID=13\n");
   _files.put("/proc/sys/kernel/osrelease", "6.1.0-18\n");
   _files.put("/proc/device-tree/model", std::string_view("Board Model B\0", 14));
@@ -98,10 +96,7 @@ TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChange
   const std::string id = "3d1219c7c4c5404aaa1f6d2a48adfda4";
   _files.put("/etc/machine-id", id + "\n");
   const auto device = _properties.value("UniqueDeviceID");
-  ASSERT_TRUE(device);
-  EXPECT_EQ(device->size(), 40u);
-  EXPECT_EQ(device->find_first_not_of("0123456789abcdef"), std::string::npos);
-  EXPECT_EQ(_properties.value("UniqueDeviceID"), device);
+  EXPECT_THAT(device.value_or(""), ::testing::MatchesRegex("[0-9a-f]{40}"));
   // Not what any other program makes of it that takes the bare SHA-256.
   EXPECT_NE(device, "0035969ec53f6e7f0fb40f08cc9ed4783aa99c20");
   _files.put("/etc/machine-id", "4d1219c7c4c5404aaa1f6d2a48adfda4\n");
@@ -122,14 +117,12 @@ TEST(Locale, FindsTheCountryInALocaleName) {
 
 class EnvironmentLocaleTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    for (const char* variable : {"LC_ALL", "LC_MESSAGES", "LANG"}) ::unsetenv(variable);
-  }
-  void TearDown() override {
-    SetUp();
-    ::unsetenv("TZ");
+  static void forget() {
+    for (const char* variable : {"LC_ALL", "LC_MESSAGES", "LANG", "TZ"}) ::unsetenv(variable);
     ::tzset();
   }
+  void SetUp() override { forget(); }
+  void TearDown() override { forget(); }
   FakeFileStore _files;
   EnvironmentLocale _locale{_files, "/root/etc/locale.conf"};
 };

@@ -1,4 +1,4 @@
-// The HTTP client against a real TLS server on loopback.
+// The HTTP client against the lab's real TLS server on loopback.
 #include "platform/http_client.h"
 
 #include <gmock/gmock.h>
@@ -6,9 +6,11 @@
 
 #include <csignal>
 #include <future>
+#include <thread>
 
+#include "base/json.h"
 #include "fakes/temporary_directory.h"
-#include "fakes/tls_server.h"
+#include "tools/lab/server.h"
 
 namespace veltrad::platform {
 namespace {
@@ -16,12 +18,53 @@ namespace {
 using namespace std::chrono_literals;
 using testing::HasSubstr;
 using testing::Not;
-using Shape = TLSAnswer::Shape;
+
+// The lab with rules of its own, each for the requests below a path. Its first key and certificate serve all.
+class Server {
+ public:
+  explicit Server(std::initializer_list<const char*> rules = {}, bool strange = false)
+      : _directory(open(_place, strange)), _server(_directory, 60) {
+    for (const char* rule : rules) _server.add(lab::ruleFromJSON(rule).value());
+    EXPECT_EQ(_server.start(0), std::nullopt);
+  }
+  std::string certificate() const { return _place.read("certificate.pem"); }
+  std::string url(const std::string& path = "/") const { return _server.url() + path; }
+  std::vector<Dictionary> requests() const {
+    std::vector<Dictionary> requests;
+    for (const char* kind : {"events", "storebags"}) {
+      std::ifstream file(_directory.receivedPath(kind));
+      for (std::string line; std::getline(file, line);)
+        if (const auto read = parseJSON(line)) requests.push_back(*read.value().asDictionary());
+    }
+    return requests;
+  }
+  bool waitForRequests(std::size_t count) const {
+    const auto deadline = std::chrono::steady_clock::now() + 20s;
+    while (requests().size() < count && std::chrono::steady_clock::now() < deadline)
+      std::this_thread::yield();
+    return requests().size() >= count;
+  }
+
+ private:
+  static lab::Directory open(const TemporaryDirectory& place, bool strange) {
+    static const TemporaryDirectory keys;
+    static const auto made = lab::Directory::open(keys.path());
+    for (const char* name : {"signing", "certificate.pem", "certificate-key.pem"})
+      if (!strange || name[0] == 's')
+        std::filesystem::copy(keys.path(name), place.path(name), std::filesystem::copy_options::recursive);
+    return lab::Directory::open(place.path()).value();
+  }
+
+  const TemporaryDirectory _place;
+  const lab::Directory _directory;
+  lab::Server _server;
+};
+
+constexpr const char* kStall = R"({"path": "/", "stall": true})";
 
 class HTTPClientTest : public testing::Test {
  protected:
   static void SetUpTestSuite() { std::signal(SIGPIPE, SIG_IGN); }
-
   static HTTPRequest get(std::string url, HTTPRequest::Lane lane = HTTPRequest().lane) {
     HTTPRequest request;
     request.url = std::move(url);
@@ -29,8 +72,8 @@ class HTTPClientTest : public testing::Test {
     request.lane = lane;
     return request;
   }
-  static HTTPRequest post(std::string url, std::string body) {
-    HTTPRequest request = get(std::move(url));
+  static HTTPRequest post(std::string url, std::string body, HTTPRequest::Lane lane = HTTPRequest().lane) {
+    HTTPRequest request = get(std::move(url), lane);
     request.method = HTTPRequest::Method::post;
     request.body = std::move(body);
     return request;
@@ -41,21 +84,11 @@ class HTTPClientTest : public testing::Test {
     client.start(std::move(request), [promise](HTTPResult result) { promise->set_value(std::move(result)); });
     return future;
   }
-  // A script that gives every request the same answer.
-  static TLSServer::Script always(TLSAnswer answer) {
-    return [answer = std::move(answer)](const TLSRequest&) { return answer; };
-  }
 
-  void trust(const TestCertificates& trusted) { place.write("ca.pem", trusted.authorityPEM()); }
-  void SetUp() override { trust(certificates); }
-
-  static inline const TLSAnswer kOK{200, {}, "ok"};
-  static inline const TLSAnswer kSilent{200, {}, "", Shape::silent};
-  const TestCertificates certificates;
-  TLSServer hung{certificates, always(kSilent)};
-  TLSServer healthy{certificates, always(kOK)};
+  const Server hung{kStall}, healthy;
   const TemporaryDirectory place;
   CurlHTTPClient client{{place.path("ca.pem")}};
+  void SetUp() override { place.write("ca.pem", healthy.certificate()); }
 };
 
 #define EXPECT_TRANSPORT_ERROR(result, text)                                   \
@@ -67,100 +100,86 @@ class HTTPClientTest : public testing::Test {
     EXPECT_THAT(r.error().description, Not(testing::ContainsRegex("[\r\n]"))); \
   } while (false)
 
-TEST_F(HTTPClientTest, AnswersOfEveryShapeArriveWhole) {
-  const std::vector<TLSAnswer> answers = {
-      {200, {{"Last-Modified", "Tue, 01 Jul 2025 10:00:00 GMT"}}, "body"},
-      {404, {}, "no such storebag"},
-      {503, {{"Retry-After", "9"}, {"retry-after", "10"}}, ""},
-      {304, {{"X-Empty", ""}}, ""},
-      {302, {{"Location", "/other"}}, ""},  // not followed
-      {200, {}, std::string(1'000'000, 'b')},
-  };
-  TLSServer server(certificates, [&](const TLSRequest& request) {
-    return answers.at(std::stoul(request.head.substr(request.head.find('/') + 1)));
-  });
-  for (std::size_t i = 0; i < answers.size(); ++i) {
-    SCOPED_TRACE(i);
-    const HTTPResult result = client.perform(get(server.url("/" + std::to_string(i), "localhost")));
+TEST_F(HTTPClientTest, AnswersArriveWholeAndAreNotFollowed) {
+  const std::string large(1'000'000, 'b');
+  const Server server({R"({"path": "/a", "status": 503, "headers": {"Retry-After": "9"}, "body": ""})",
+                       R"({"path": "/b", "status": 302, "headers": {"Location": "/c"}, "body": "there"})",
+                       (R"({"path": "/c", "body": ")" + large + "\"}").c_str()});
+  const std::tuple<const char*, int, HTTPHeaders::value_type, std::string> cases[] = {
+      {"/a", 503, {"Retry-After", "9"}, ""},
+      {"/b", 302, {"Location", "/c"}, "there"},
+      {"/c", 200, {"Content-Length", "1000000"}, large}};
+  for (const auto& [path, status, header, body] : cases) {
+    const HTTPResult result = client.perform(post(server.url(path), "{}"));
     ASSERT_TRUE(result.ok()) << result.error().description;
-    EXPECT_EQ(result.value().status, answers[i].status);
-    EXPECT_EQ(result.value().body, answers[i].body);
-    for (const auto& header : answers[i].headers) {
-      EXPECT_THAT(result.value().headers, testing::Contains(header));
-    }
+    EXPECT_EQ(result.value().status, status);
+    EXPECT_EQ(result.value().body, body);
+    EXPECT_THAT(result.value().headers, testing::Contains(header));
   }
-  EXPECT_EQ(server.requests().size(), answers.size());
-  EXPECT_EQ(server.connections(), 1u);  // kept alive
   const HTTPResponse response{200, {{"retry-AFTER", "9"}, {"Retry-After", "10"}}, ""};
   EXPECT_EQ(response.header("Retry-After"), "9");
   EXPECT_EQ(response.header("Retry"), std::nullopt);
 }
 
 TEST_F(HTTPClientTest, SendsExactlyWhatTheRequestSays) {
-  TLSServer server(certificates, always({}));
-  const std::string body(300'000, 'p');
-  HTTPRequest request = post(server.url("/a?b=c"), body);
-  request.headers = {
-      {"User-Agent", "one\r\nInjected: yes"}, {"X-Empty", " \t"},           {"content-length", "5"},
-      {"Transfer-Encoding", "chunked"},       {"Bad\r\nName", "value"},     {"Expect", "100-continue"},
-      {"Content-Type", "application/json"},   {"X-Text", "caf\xc3\xa9\x7f"}};
+  const std::string text(300'000, 'p');
+  HTTPRequest request = post(healthy.url("/a?b=c"), '"' + text + '"');
+  request.headers = {{"User-Agent", "one\r\nInjected: yes"},
+                     {"content-length", "5"},
+                     {"Transfer-Encoding", "chunked"},
+                     {"Bad\r\nName", "value"},
+                     {"Expect", "100-continue"},
+                     {"Content-Type", "application/json"},
+                     {"X-Text", "caf\xc3\xa9\x7f"}};
   ASSERT_TRUE(client.perform(std::move(request)).ok());
-  ASSERT_TRUE(client.perform(post(server.url(), "")).ok());
-  const std::vector<TLSRequest> requests = server.requests();
-  const std::string host = "Host: 127.0.0.1:" + std::to_string(server.port()) + "\r\n";
-  EXPECT_EQ(requests.at(0).head,
-            "POST /a?b=c HTTP/1.1\r\n" + host +
-                "User-Agent: oneInjected: yes\r\nX-Empty:\r\nContent-Type: application/json\r\n"
-                "X-Text: caf\xc3\xa9\r\nContent-Length: 300000\r\n\r\n");
-  EXPECT_EQ(requests.at(0).body, body);
-  EXPECT_EQ(requests.at(1).head, "POST / HTTP/1.1\r\n" + host + "Content-Length: 0\r\n\r\n");
+  ASSERT_TRUE(client.perform(post(healthy.url(), "")).ok());
+  const auto requests = healthy.requests();
+  ASSERT_EQ(requests.size(), 2u);
+  const std::string host = healthy.url("").substr(8);
+  EXPECT_EQ(*requests[0].dictionary("headers"), (Dictionary{{"Host", host},
+                                                            {"User-Agent", "oneInjected: yes"},
+
+                                                            {"Content-Type", "application/json"},
+                                                            {"X-Text", "caf\xc3\xa9"},
+                                                            {"Content-Length", "300002"}}));
+  EXPECT_EQ(*requests[0].string("path"), "/a?b=c");
+  EXPECT_EQ(*requests[0].string("body"), text);
+  EXPECT_EQ(*requests[1].dictionary("headers"), (Dictionary{{"Host", host}, {"Content-Length", "0"}}));
 }
 
 TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
-  const struct {
-    TLSAnswer answer;
-    std::size_t most;
-    const char* text;
-  } cases[] = {
-      {{200, {}, std::string(1000, 'x'), Shape::cut}, 16u << 20, ""},
-      {{200, {}, "", Shape::endless}, 100'000, "The answer is larger than 100000 bytes"},
-      {{200, {}, std::string(2000, 'x')}, 1000, "The answer is larger than 1000 bytes"},
-      {{200, {}, "", Shape::endlessHead}, 100'000, "The answer is larger than 100000 bytes"},
-      {{200, {}, "", Shape::endlessHead}, 16u << 20, "The answer's headers are larger than 262144 bytes"},
-      {kSilent, 1000, "time"}};
-  for (const auto& bad : cases) {
-    TLSServer server(certificates, always(bad.answer));
-    HTTPRequest request = get(server.url());
-    request.mostResponseBytes = bad.most;
-    if (bad.answer.shape == Shape::silent) request.timeout = 300ms;
-    EXPECT_TRANSPORT_ERROR(client.perform(std::move(request)), HasSubstr(bad.text));
+  std::string headers = R"({"path": "/", "headers": {"X": "x")";
+  for (int i = 0; i < 30; ++i)
+    headers += ", \"X" + std::to_string(i) + "\": \"" + std::string(10'000, 'x') + '"';
+  headers += "}}";
+  const std::string body = R"("body": ")" + std::string(2000, 'x') + "\"}";
+  const std::tuple<std::string, std::size_t, const char*> cases[] = {
+      {R"({"path": "/", "cutHalfway": true, )" + body, 16u << 20, ""},
+      {R"({"path": "/", "endless": true})", 100'000, "The answer is larger than 100000 bytes"},
+      {R"({"path": "/", )" + body, 1000, "The answer is larger than 1000 bytes"},
+      {headers, 100'000, "The answer is larger than 100000 bytes"},
+      {headers, 16u << 20, "The answer's headers are larger than 262144 bytes"},
+      {kStall, 1000, "time"}};
+  for (const auto& [rule, most, text] : cases) {
+    const Server server({rule.c_str()});
+    HTTPRequest request = get(server.url("/x"));
+    request.mostResponseBytes = most;
+    if (rule == kStall) request.timeout = 300ms;
+    EXPECT_TRANSPORT_ERROR(client.perform(std::move(request)), HasSubstr(text));
   }
 }
 
 TEST_F(HTTPClientTest, APostIsNeverSentTwice) {
-  std::atomic<int> asked{0};
-  TLSServer server(certificates, [&](const TLSRequest&) {
-    return ++asked == 1 ? TLSAnswer{} : TLSAnswer{200, {}, "", Shape::hangUp};
-  });
+  const Server server({R"({"path": "/cut", "cut": true})"});
   ASSERT_TRUE(client.perform(post(server.url(), "kept alive")).ok());
   for (const char* connection : {"kept", "new"}) {
-    EXPECT_TRANSPORT_ERROR(client.perform(post(server.url(), connection)), "Empty reply from server");
+    EXPECT_TRANSPORT_ERROR(client.perform(post(server.url("/cut"), connection)), "Empty reply from server");
   }
   EXPECT_EQ(server.requests().size(), 3u);
 }
 
-TEST_F(HTTPClientTest, APostIsNotSentOnAKeptConnectionThatItsServerClosed) {
-  TLSServer server(certificates, always({200, {}, "", TLSAnswer::Shape::thenCloses}));
-  for (std::size_t sent = 1; sent <= 3; ++sent) {
-    EXPECT_TRUE(client.perform(post(server.url(), "x")).ok());
-    ASSERT_TRUE(server.waitForAllClosed());
-    EXPECT_EQ(server.requests().size(), sent);
-    EXPECT_EQ(server.connections(), sent);
-  }
-}
-
 TEST_F(HTTPClientTest, UnreachableServersAreTransportErrors) {
-  const std::string refused = TLSServer(certificates, always({})).url();
+  const std::string refused = Server().url();
   EXPECT_TRANSPORT_ERROR(client.perform(get(refused)), HasSubstr("connect"));
   EXPECT_TRANSPORT_ERROR(client.perform(get("https://host.invalid/")),
                          "Could not resolve host: host.invalid");
@@ -170,19 +189,15 @@ TEST_F(HTTPClientTest, UnreachableServersAreTransportErrors) {
 }
 
 TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {
-  const TestCertificates strange, otherName("DNS:elsewhere.example");
-  {
-    TLSServer server(strange, always({}));
-    EXPECT_TRANSPORT_ERROR(client.perform(post(server.url(), "secret")), HasSubstr("certificate"));
-    EXPECT_TRUE(server.waitForRefusedHandshake());
-    EXPECT_EQ(server.applicationBytes(), 0u);
-    trust(strange);  // the file is read again
-    EXPECT_TRUE(client.perform(get(server.url())).ok());
-  }
-  trust(otherName);
-  TLSServer server(otherName, always({}));
-  EXPECT_TRANSPORT_ERROR(client.perform(post(server.url(), "secret")), HasSubstr("subject"));
-  EXPECT_EQ(server.applicationBytes(), 0u);
+  const Server strange({}, true);
+  EXPECT_TRANSPORT_ERROR(client.perform(post(strange.url(), "secret")), HasSubstr("certificate"));
+  const std::string port = strange.url("").substr(strange.url("").rfind(':'));
+  place.write("ca.pem", strange.certificate());  // the file is read again
+  // The same server under a name that its certificate does not hold.
+  EXPECT_TRANSPORT_ERROR(client.perform(post("https://0.0.0.0" + port, "secret")), HasSubstr("subject"));
+  EXPECT_TRUE(client.perform(post(strange.url(), "\"known\"")).ok());
+  ASSERT_EQ(strange.requests().size(), 1u);
+  EXPECT_EQ(*strange.requests()[0].string("body"), "known");
 }
 
 TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
@@ -198,11 +213,11 @@ TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
   EXPECT_EQ(client.underWay(), 1024u);
 
   ASSERT_TRUE(hung.waitForRequests(6));
-  EXPECT_TRUE(client.perform(get(healthy.url(), HTTPRequest::Lane::storebag)).ok());
+  EXPECT_TRUE(client.perform(get(healthy.url("/x"), HTTPRequest::Lane::storebag)).ok());
   client.drain(std::chrono::steady_clock::now());
   EXPECT_EQ(stopped, 1024);
   EXPECT_EQ(client.underWay(), 0u);
-  EXPECT_LE(hung.mostOpen(), 8u);
+  EXPECT_LE(hung.requests().size(), 8u);
   EXPECT_EQ(start(get(healthy.url())).get().error().kind, HTTPError::Kind::stopping);
 }
 
@@ -220,41 +235,33 @@ TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOu
     waiting.push_back(start(std::move(request)));
   }
   EXPECT_TRUE(start(post(healthy.url(), "y")).get().ok());
-  EXPECT_TRANSPORT_ERROR(waiting[19].get(), HasSubstr("while waiting for a connection to 127.0.0.1:"));
+  EXPECT_TRANSPORT_ERROR(waiting[19].get(), HasSubstr("while waiting for a connection to localhost:"));
   auto asked = start(get(hung.url("/storebag"), HTTPRequest::Lane::storebag));
   EXPECT_TRUE(hung.waitForRequests(7));  // it reached even the host that hangs
 }
 
-TEST_F(HTTPClientTest, UploadsRunTwoAtATimeInOrder) {
-  std::mutex mutex;
-  std::condition_variable changed;
-  int at = 0, most = 0;
-  TLSServer server(certificates, [&](const TLSRequest&) {
-    std::unique_lock lock(mutex);
-    most = std::max(most, ++at);
-    changed.notify_all();
-    changed.wait_for(lock, 10s, [&] { return most >= 2; });  // the first waits for the second
-    --at;
-    return TLSAnswer{};
-  });
+TEST_F(HTTPClientTest, UploadsRunTwoAtATime) {
   std::vector<std::future<HTTPResult>> uploads;
-  for (int i = 0; i < 6; ++i) {
-    HTTPRequest request = post(server.url("/" + std::to_string(i)), std::string(200'000, 'u'));
-    request.lane = HTTPRequest::Lane::upload;
-    request.leastBytesPerSecond = 1024;
-    uploads.push_back(start(std::move(request)));
+  for (const Server* server : {&healthy, &hung}) {
+    for (int i = 0; i < 6; ++i) {
+      HTTPRequest request = post(server->url(), std::string(200'000, 'u'), HTTPRequest::Lane::upload);
+      request.leastBytesPerSecond = 1024;
+      uploads.push_back(start(std::move(request)));
+    }
   }
-  for (auto& upload : uploads) EXPECT_TRUE(upload.get().ok());
-  EXPECT_EQ(most, 2);
+  for (std::size_t i = 0; i < 6; ++i) EXPECT_TRUE(uploads[i].get().ok());
+  ASSERT_TRUE(hung.waitForRequests(2));
+  EXPECT_TRUE(client.perform(get(healthy.url("/x"))).ok());  // what would have come has come before this
+  EXPECT_EQ(hung.requests().size(), 2u);
 }
 
 TEST_F(HTTPClientTest, WaitersAreFreedAndLaterOnesFailAtOnce) {
-  auto waiter = std::async(std::launch::async, [&] { return client.perform(get(hung.url())); });
+  auto waiter = std::async(std::launch::async, [&] { return client.perform(get(hung.url("/x"))); });
   auto event = start(post(hung.url(), "x"));
   ASSERT_TRUE(hung.waitForRequests(2));
   client.failBlockingWaits();
   EXPECT_EQ(waiter.get().error().kind, HTTPError::Kind::stopping);
-  EXPECT_EQ(client.perform(get(hung.url())).error().kind, HTTPError::Kind::stopping);
+  EXPECT_EQ(client.perform(get(hung.url("/x"))).error().kind, HTTPError::Kind::stopping);
   EXPECT_EQ(client.underWay(), 1u);  // posts go on
 }
 

@@ -73,14 +73,6 @@ TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {
   EXPECT_EQ(_preferences.text(kDomain, "kept"), "1");
 }
 
-TEST_F(FilePreferencesTest, AMalformedFileThatCannotBePutAsideIsOneLineAndStays) {
-  _files.put(kPath, "rubbish");
-  _files.failWrites(Kind::noAccess);
-  _log.expectLine(Level::error, "; not renamed, /preferences/");
-  for (int i = 0; i < 2; ++i) EXPECT_FALSE(_preferences.value(kDomain, "a"));
-  EXPECT_EQ(_files.bytes(kPath), "rubbish");
-}
-
 TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
   put({{"empty", ""}});
   EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", randomUUIDText).size(), 36u);
