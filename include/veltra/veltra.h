@@ -151,14 +151,16 @@ typedef struct veltra_session_options {
   /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped; one that has the
    * queue for itself may be larger. */
   size_t queue_bytes;
+  /* Says nothing of the session on connecting: for one-shot messages, which say it themselves. */
+  bool undescribed;
 } veltra_session_options;
 
 /* Fills in the defaults and `size`. */
 VELTRA_API void veltra_session_options_init(veltra_session_options* options);
 
-/* Connects and describes the session. NULL on failure; then `*error`, when `error` is not NULL, is a text
- * that says what is wrong and what to do, to be freed with veltra_free, and `*status`, when not NULL, the
- * status. */
+/* Connects and describes the session (unless undescribed). NULL on failure; then `*error`, when `error` is
+ * not NULL, is a text that says what is wrong and what to do, to be freed with veltra_free, and `*status`,
+ * when not NULL, the status. */
 VELTRA_API veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
                                                  char** error);
 VELTRA_API void veltra_free(char* text);
@@ -183,6 +185,18 @@ VELTRA_API veltra_status veltra_session_send_dictionary(veltra_session*, const v
                                                         veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_send_dictionary_wait(veltra_session*, const veltra_value* message,
                                                              veltra_reply** reply);
+
+/* One message with all that the daemon must know about its sender, who need not have started: `who` as for
+ * veltra_session_create (its user info and names, all up to batch_events; client type and session ID are
+ * needed, or there is no answer). The reply's text is "finished", whatever became of the message, or
+ * "storebag not available". The session is `who` from then on. */
+VELTRA_API veltra_status veltra_session_send_one_shot(veltra_session*, const veltra_session_options* who,
+                                                      uint16_t category, uint16_t type,
+                                                      const veltra_value* payload, veltra_callback,
+                                                      void* context);
+VELTRA_API veltra_status veltra_session_send_one_shot_wait(veltra_session*, const veltra_session_options* who,
+                                                           uint16_t category, uint16_t type,
+                                                           const veltra_value* payload, veltra_reply** reply);
 
 VELTRA_API veltra_status veltra_session_flush(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply** reply);

@@ -220,6 +220,7 @@ struct Options {
   std::function<void(const Aggregated&)> aggregated = {};  // given: this session aggregates
   std::optional<std::string> root = {};                    // absent: VELTRA_ROOT, else "/"
   std::size_t queueBytes = 0;                              // 1 MiB where 0
+  bool undescribed = false;                                // says nothing of itself: for one-shot messages
 };
 
 // A session from its making to its end. One that could not be made is false, says why, and refuses every
@@ -227,20 +228,9 @@ struct Options {
 class Session {
  public:
   explicit Session(const Options& options = {}) : _aggregated(sharedHandler(options.aggregated)) {
-    veltra_session_options plain;
-    veltra_session_options_init(&plain);
+    veltra_session_options plain = identityOf(options);
     plain.root = text(options.root);
-    plain.has_client_type = options.clientType.has_value();
-    plain.client_type = options.clientType.value_or(0);
-    plain.has_session_id = options.sessionID.has_value();
-    plain.session_id = options.sessionID.value_or(0);
-    plain.has_client_version = options.clientVersion.has_value();
-    plain.client_version = options.clientVersion.value_or(0);
-    plain.require_user_info = options.requireUserInfo;
-    plain.batch_events = options.batchEvents;
-    plain.user_info = options.userInfo.get();
-    plain.client_name = text(options.clientName);
-    plain.service_name = text(options.serviceName);
+    plain.undescribed = options.undescribed;
     plain.aggregated = _aggregated ? &onAggregated : nullptr;
     plain.aggregated_context = _aggregated.get();
     plain.queue_bytes = options.queueBytes;
@@ -305,6 +295,14 @@ class Session {
       return call(std::move(callback), &veltra_session_send_dictionary, message.get());
     });
   }
+  // Without a start; of `who` what stands before `aggregated`. "finished", or "storebag not available".
+  std::future<Reply> sendOneShot(const Options& who, std::uint16_t category, std::uint16_t type,
+                                 const Dictionary& payload = {}) {
+    return promised([&](Callback callback) {
+      const veltra_session_options plain = identityOf(who);
+      return call(std::move(callback), &veltra_session_send_one_shot, &plain, category, type, payload.get());
+    });
+  }
   Status start(Callback callback) { return call(std::move(callback), &veltra_session_start); }
   Status flush(Callback callback) { return call(std::move(callback), &veltra_session_flush); }
   Status states(const Value& userInfo, Callback callback) {
@@ -326,6 +324,23 @@ class Session {
 
   static const char* text(const std::optional<std::string>& given) {
     return given ? given->c_str() : nullptr;
+  }
+  // Borrows the texts.
+  static veltra_session_options identityOf(const Options& options) {
+    veltra_session_options plain;
+    veltra_session_options_init(&plain);
+    plain.has_client_type = options.clientType.has_value();
+    plain.client_type = options.clientType.value_or(0);
+    plain.has_session_id = options.sessionID.has_value();
+    plain.session_id = options.sessionID.value_or(0);
+    plain.has_client_version = options.clientVersion.has_value();
+    plain.client_version = options.clientVersion.value_or(0);
+    plain.require_user_info = options.requireUserInfo;
+    plain.batch_events = options.batchEvents;
+    plain.user_info = options.userInfo.get();
+    plain.client_name = text(options.clientName);
+    plain.service_name = text(options.serviceName);
+    return plain;
   }
   static std::unique_ptr<Handler> sharedHandler(const Handler& handler) {
     return handler ? std::make_unique<Handler>(handler) : nullptr;

@@ -40,6 +40,19 @@ Value sessionInfo(const veltra_session_options& options) {
   return info;
 }
 
+// Session info, and user info where there is any.
+Entries identity(const veltra_session_options& options) {
+  Entries arguments;
+  arguments.emplace_back("sessionInfo", sessionInfo(options));
+  if (options.user_info || options.client_name || options.service_name) {
+    Dictionary userInfo = dictionaryOfNode(options.user_info);
+    if (options.client_name) userInfo.set(kVeltraUserInfoClientName, mended(options.client_name));
+    if (options.service_name) userInfo.set(kVeltraUserInfoServiceName, mended(options.service_name));
+    arguments.emplace_back("userInfo", std::move(userInfo));
+  }
+  return arguments;
+}
+
 }  // namespace
 
 CallFrame callFrame(const char* operation, Entries arguments) {
@@ -81,16 +94,20 @@ CallFrame dictionaryFrame(const char* operation, const char* argument, const vel
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
   if (!absentOrDictionary(options.user_info)) return {VELTRA_INVALID, {}};
   if (!fits(options.user_info)) return {VELTRA_TOO_LARGE, {}};
-  Entries arguments;
-  arguments.emplace_back("sessionInfo", sessionInfo(options));
+  Entries arguments = identity(options);
   arguments.emplace_back("hasAggregationBlock", options.aggregated != nullptr);
-  if (options.user_info || options.client_name || options.service_name) {
-    Dictionary userInfo = dictionaryOfNode(options.user_info);
-    if (options.client_name) userInfo.set(kVeltraUserInfoClientName, mended(options.client_name));
-    if (options.service_name) userInfo.set(kVeltraUserInfoServiceName, mended(options.service_name));
-    arguments.emplace_back("userInfo", std::move(userInfo));
-  }
   return callFrame(kSetSessionInfo, std::move(arguments));
+}
+
+CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
+                       const veltra_value* payload) {
+  if (!absentOrDictionary(who.user_info) || !absentOrDictionary(payload)) return {VELTRA_INVALID, {}};
+  if (!fits(who.user_info) || !fits(payload)) return {VELTRA_TOO_LARGE, {}};
+  Entries arguments = identity(who);
+  arguments.emplace_back("category", static_cast<unsigned>(category));
+  if (payload) arguments.emplace_back("payload", dictionaryOfNode(payload));
+  arguments.emplace_back("type", static_cast<unsigned>(type));
+  return callFrame(kSendOneShot, std::move(arguments));
 }
 
 }  // namespace veltrad

@@ -17,6 +17,8 @@ inline constexpr const char* kFinishSession = "finishSessionWithReply:";
 inline constexpr const char* kFlushMessages = "flushMessagesWithCompletion:";
 inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:";
 inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
+inline constexpr const char* kSendOneShot =
+    "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
 inline constexpr const char* kSetSessionInfo =
     "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
 inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
@@ -36,5 +38,7 @@ enum class Missing { allowed, invalid };
 CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary,
                           Missing missing);
 CallFrame sessionInfoFrame(const veltra_session_options& options);
+CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
+                       const veltra_value* payload);
 
 }  // namespace veltrad

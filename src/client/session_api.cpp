@@ -64,6 +64,12 @@ veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply*
   return result;
 }
 
+CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
+                  const veltra_value* payload) {
+  if (!who || who->size < sizeof *who) return {VELTRA_INVALID, {}};
+  return veltrad::oneShotFrame(*who, category, type, payload);
+}
+
 }  // namespace
 
 void veltra_session_options_init(veltra_session_options* options) {
@@ -91,7 +97,7 @@ veltra_session* veltra_session_create(const veltra_session_options* options, vel
   }
   const auto root = options->root && *options->root ? veltrad::platform::Root(options->root)
                                                     : veltrad::platform::Root::fromEnvironment();
-  auto reached = veltrad::reachDaemon(root.socketPath(), description.frame);
+  auto reached = veltrad::reachDaemon(root.socketPath(), options->undescribed ? "" : description.frame);
   if (!reached) return failed(reached.error().status, reached.error().text, status, error);
   std::string text;
   auto connection = veltrad::DaemonConnection::make(
@@ -138,6 +144,18 @@ veltra_status veltra_session_send_dictionary_wait(veltra_session* session, const
       session,
       veltrad::dictionaryFrame(veltrad::kSendDictionary, "message", message, veltrad::Missing::invalid),
       reply);
+}
+
+veltra_status veltra_session_send_one_shot(veltra_session* session, const veltra_session_options* who,
+                                           uint16_t category, uint16_t type, const veltra_value* payload,
+                                           veltra_callback callback, void* context) {
+  return send(session, oneShot(who, category, type, payload), callback, context);
+}
+
+veltra_status veltra_session_send_one_shot_wait(veltra_session* session, const veltra_session_options* who,
+                                                uint16_t category, uint16_t type, const veltra_value* payload,
+                                                veltra_reply** reply) {
+  return sendAndWait(session, oneShot(who, category, type, payload), reply);
 }
 
 veltra_status veltra_session_flush(veltra_session* session, veltra_callback callback, void* context) {

@@ -88,6 +88,12 @@ TEST(Refusal, OfArgumentsSendsNothing) {
   EXPECT_EQ(veltra_session_send_dictionary(session.get(), nullptr, nullptr, nullptr), VELTRA_INVALID);
   EXPECT_EQ(veltra_session_states(session.get(), number.get(), nullptr, nullptr), VELTRA_INVALID);
   EXPECT_EQ(veltra_session_send_dictionary_wait(session.get(), large.get(), nullptr), VELTRA_TOO_LARGE);
+  veltra_session_options who{};
+  EXPECT_EQ(veltra_session_send_one_shot_wait(session.get(), &who, 1, 1, nullptr, nullptr), VELTRA_INVALID);
+  veltra_session_options_init(&who);
+  who.user_info = large.get();
+  EXPECT_EQ(veltra_session_send_one_shot(session.get(), &who, 1, 1, nullptr, nullptr, nullptr),
+            VELTRA_TOO_LARGE);
   veltra_statistics counts;
   veltra_session_statistics(session.get(), &counts);
   EXPECT_EQ(counts.sent, 0u);

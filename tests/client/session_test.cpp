@@ -49,12 +49,14 @@ TEST(Session, CarriesAWholeConversation) {
   EXPECT_TRUE(session.sendAndWait(5, 4, {{"at", veltra::Date{7}}, {"raw", veltra::Data{"\1\2"}}}));
   EXPECT_EQ(*session.displayURL(), "fetchDisplayURL:");
   EXPECT_TRUE(session.states(veltra::Dictionary{{"list", veltra::Array{1, "two", true}}}));
+  const veltra::Options other{.sessionID = 3, .clientName = "lamp", .requireUserInfo = true};
+  EXPECT_TRUE(session.sendOneShot(other, 1, 2, {{"k", "v"}}).get());
   EXPECT_TRUE(session.flush());
   ASSERT_TRUE(copies.waitForLines(2));
   EXPECT_THAT(copies.lines(), ElementsAre("12.250000 65537 8 two", "0.000000 0 0 (none)"));
   EXPECT_TRUE(session.finish());
   veltra::Session moved = std::move(session);
-  EXPECT_EQ(moved.statistics().replies, 8u);
+  EXPECT_EQ(moved.statistics().replies, 9u);
   EXPECT_EQ(moved.close(), 0u);
   EXPECT_THAT(
       calls.lines(),
@@ -72,6 +74,9 @@ TEST(Session, CarriesAWholeConversation) {
                   R"({"category":5,"payload":{"at":{"$date":7.0},"raw":{"$data":"AQI="}},"type":4})",
                   "fetchDisplayURL: {}",
                   R"(fetchStatesWithUserInfo:completionHandler: {"userInfo":{"list":[1,"two",true]}})",
+                  "sendMessageWithSessionInfo:userInfo:category:type:payload:reply: "
+                  R"({"category":1,"payload":{"k":"v"},"sessionInfo":{"batchEvent":false,)"
+                  R"("requireUserInfo":true,"sessionID":3},"type":2,"userInfo":{"clientName":"lamp"}})",
                   "flushMessagesWithCompletion: {}", "finishSessionWithReply: {}"));
 }
 

@@ -193,6 +193,31 @@ class Ctl(SystemTest):
                 self.assertTrue(said)
             daemon.wait_for_line("was invalidated", 3)
 
+    def test_one_shot(self):
+        """One message and nothing around it; a call that the daemon does not answer ends at once."""
+        def one_shot(*options, status=0):
+            out, said = self.ctl("one-shot", *options, "--category", "9", "--type", "4", "codec=opus", status=status)
+            return json.loads(out), said
+
+        with self.serving("user info provided without requiring it", "Could not retrieve identifiers",
+                          "Could not find storebag name for client type 2") as daemon:
+            identity = ["--client-type", "7", "--session-id", "77"]
+            for info in (["--client", "phone", "--require-user-info"], ["--client", "lamp"], []):
+                self.assertEqual(one_shot(*identity, *info)[0], {"op": "oneShot", "reply": "finished"})
+            daemon.wait_for_line("sendMessageWithSessionInfo: Sending single message with sessionID 77", 3)
+            self.assertEqual(one_shot("--client-type", "2", "--session-id", "1")[0]["reply"],
+                             "storebag not available")
+            for missing in (identity[:2], identity[2:]):
+                answer, said = one_shot(*missing, status=1)
+                self.assertIsNone(answer["reply"])
+                self.assertIn("The daemon gave no reply.", said)
+            self.lab.wait_for_events(3)
+            self.assertFalse([line for line in daemon.text if "setSessionInfo" in line or "startConfig" in line])
+        events = self.lab.events()
+        self.assertEqual([(e["_method"], e["_status"], e["codec"]) for e in events], [(9, 4, "opus")] * 3)
+        self.assertEqual(sorted(e.get("clientName", "") for e in events), ["", "lamp", "phone"])
+        self.assertEqual(self.lab.received("events", 3)[0]["headers"]["X-VLT-Event-Map"], "9 4")
+
     def test_stats(self):
         with self.serving("Could not find storebag name for client type 2"):
             self.ctl("send", "--client-type", "2", "--category", "1", "--type", "1")

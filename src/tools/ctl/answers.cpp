@@ -51,6 +51,7 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
       text += ",\"backends\":" + formatBackends(answer.backends);
       break;
     case Operation::send:
+    case Operation::oneShot:
     case Operation::flush:
     case Operation::displayURL:
     case Operation::finish:

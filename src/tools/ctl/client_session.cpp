@@ -35,6 +35,22 @@ Answer answerOf(const veltra_reply* reply) {
   return answer;
 }
 
+// Borrows `userInfo`.
+veltra_session_options optionsOf(const Identity& identity, const VeltraValue& userInfo) {
+  veltra_session_options options;
+  veltra_session_options_init(&options);
+  options.has_client_type = identity.clientType.has_value();
+  options.client_type = identity.clientType.value_or(0);
+  options.has_session_id = identity.sessionID.has_value();
+  options.session_id = identity.sessionID.value_or(0);
+  options.has_client_version = identity.clientVersion.has_value();
+  options.client_version = identity.clientVersion.value_or(0);
+  options.require_user_info = identity.requireUserInfo;
+  options.batch_events = identity.batchEvents;
+  options.user_info = userInfo.get();
+  return options;
+}
+
 }  // namespace
 
 ClientSession::ClientSession(Interrupt& interrupt, CopyHandler aggregated)
@@ -48,23 +64,24 @@ ClientSession::~ClientSession() {
 
 std::optional<std::string> ClientSession::open(const std::optional<std::string>& root,
                                                const Identity& identity) {
-  if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
   const VeltraValue userInfo = toVeltraValue(identity.userInfo);
-  veltra_session_options options;
-  veltra_session_options_init(&options);
-  options.root = root ? root->c_str() : nullptr;
-  options.has_client_type = identity.clientType.has_value();
-  options.client_type = identity.clientType.value_or(0);
-  options.has_session_id = identity.sessionID.has_value();
-  options.session_id = identity.sessionID.value_or(0);
-  options.has_client_version = identity.clientVersion.has_value();
-  options.client_version = identity.clientVersion.value_or(0);
-  options.require_user_info = identity.requireUserInfo;
-  options.batch_events = identity.batchEvents;
-  options.user_info = userInfo.get();
+  veltra_session_options options = optionsOf(identity, userInfo);
   options.aggregated = _aggregated ? &ClientSession::aggregated : nullptr;
   options.aggregated_context = this;
+  return create(options, root);
+}
 
+std::optional<std::string> ClientSession::openUndescribed(const std::optional<std::string>& root) {
+  veltra_session_options options;
+  veltra_session_options_init(&options);
+  options.undescribed = true;
+  return create(options, root);
+}
+
+std::optional<std::string> ClientSession::create(veltra_session_options& options,
+                                                 const std::optional<std::string>& root) {
+  if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
+  options.root = root ? root->c_str() : nullptr;
   veltra_status status = VELTRA_OK;
   char* error = nullptr;
   _session = veltra_session_create(&options, &status, &error);
@@ -95,6 +112,17 @@ std::optional<Answer> ClientSession::send(std::uint16_t category, std::uint16_t 
   const VeltraValue value = toVeltraValue(payload);
   return await([&](veltra_callback callback, void* context) {
     return veltra_session_send(_session, category, type, value.get(), flag, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::sendOneShot(const Identity& who, std::uint16_t category,
+                                                 std::uint16_t type,
+                                                 const std::optional<Dictionary>& payload) {
+  const VeltraValue userInfo = toVeltraValue(who.userInfo);
+  const veltra_session_options options = optionsOf(who, userInfo);
+  const VeltraValue value = toVeltraValue(payload);
+  return await([&](veltra_callback callback, void* context) {
+    return veltra_session_send_one_shot(_session, &options, category, type, value.get(), callback, context);
   });
 }
 

@@ -28,12 +28,16 @@ class ClientSession {
 
   // Connects. Nothing: done; else a text that says what is wrong and what to do. No root: the environment's.
   std::optional<std::string> open(const std::optional<std::string>& root, const Identity& identity);
+  // The same for a session that says nothing of itself: for sendOneShot().
+  std::optional<std::string> openUndescribed(const std::optional<std::string>& root);
 
   std::optional<Answer> start();
   // "category", "type", "payload" and "flag" as they are.
   std::optional<Answer> send(const Dictionary& message);
   std::optional<Answer> send(std::uint16_t category, std::uint16_t type,
                              const std::optional<Dictionary>& payload, std::uint32_t flag);
+  std::optional<Answer> sendOneShot(const Identity& who, std::uint16_t category, std::uint16_t type,
+                                    const std::optional<Dictionary>& payload);
   std::optional<Answer> flush();
   std::optional<Answer> states(const std::optional<Dictionary>& userInfo);
   std::optional<Answer> displayURL();
@@ -44,6 +48,7 @@ class ClientSession {
 
  private:
   using Call = std::function<veltra_status(veltra_callback, void*)>;
+  std::optional<std::string> create(veltra_session_options& options, const std::optional<std::string>& root);
   std::optional<Answer> await(const Call& call);
   // Both on the library's thread.
   static void answered(void* context, const veltra_reply* reply);

@@ -3,7 +3,7 @@
 
 namespace veltrad::ctl {
 
-enum class Operation { start, send, flush, states, displayURL, restart, sleep, finish };
+enum class Operation { start, send, oneShot, flush, states, displayURL, restart, sleep, finish };
 
 // The "op" of a line and of its answer.
 constexpr const char* operationName(Operation operation) {
@@ -12,6 +12,8 @@ constexpr const char* operationName(Operation operation) {
       return "start";
     case Operation::send:
       return "send";
+    case Operation::oneShot:
+      return "oneShot";
     case Operation::flush:
       return "flush";
     case Operation::states:

@@ -17,7 +17,7 @@ namespace veltrad::ctl {
 namespace {
 
 constexpr int kWrongUsage = 2;
-constexpr const char* kExpectedCommands = "expected session, send, states, display-url or stats";
+constexpr const char* kExpectedCommands = "expected session, send, one-shot, states, display-url or stats";
 
 // As they stand on the command line, before they are put together.
 struct Texts {
@@ -134,23 +134,37 @@ void addSession(CLI::App& app, Options& options, Texts& texts) {
   session->footer(kSessionFooter);
 }
 
+void addMessage(CLI::App& app, Options& options, Texts& texts) {
+  addNumber<std::uint16_t>(app, "--category", options.category, 65535,
+                           "What the message is about, 0 to 65535")
+      ->required();
+  addNumber<std::uint16_t>(app, "--type", options.type, 65535, "Which message of the category, 0 to 65535")
+      ->required();
+  app.add_option("payload", texts.payload,
+                 "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
+                 "false booleans, everything else a text")
+      ->type_name("")
+      ->check(CLI::Validator(keyValueProblem, ""));
+  addIdentity(app, options.identity, texts, true);
+}
+
 void addSend(CLI::App& app, Options& options, Texts& texts) {
   CLI::App* send =
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
-  addNumber<std::uint16_t>(*send, "--category", options.category, 65535,
-                           "What the message is about, 0 to 65535")
-      ->required();
-  addNumber<std::uint16_t>(*send, "--type", options.type, 65535, "Which message of the category, 0 to 65535")
-      ->required();
+  addMessage(*send, options, texts);
   addNumber<std::uint32_t>(*send, "--flag", options.flag, std::numeric_limits<std::uint32_t>::max(),
                            "1 at once, 2 whatever the sampling says, 3 both; 0 neither");
-  send->add_option("payload", texts.payload,
-                   "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
-                   "false booleans, everything else a text")
-      ->type_name("")
-      ->check(CLI::Validator(keyValueProblem, ""));
-  addIdentity(*send, options.identity, texts, true);
   send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
+}
+
+void addOneShot(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* oneShot =
+      addCommand(app, options, Command::oneShot, "one-shot", "Send one message without starting a session");
+  addMessage(*oneShot, options, texts);
+  oneShot->footer(
+      "Needs --client-type and --session-id. The reply is \"finished\", whatever became of the message,\n"
+      "or \"storebag not available\".\n\n"
+      "Example:\n  veltractl one-shot --client-type 7 --session-id 42 --category 5 --type 1 codec=opus");
 }
 
 void addQuestions(CLI::App& app, Options& options, Texts& texts) {
@@ -230,6 +244,7 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   addGlobals(app, options);
   addSession(app, options, texts);
   addSend(app, options, texts);
+  addOneShot(app, options, texts);
   addQuestions(app, options, texts);
   try {
     app.parse(argc, argv);

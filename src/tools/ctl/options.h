@@ -21,19 +21,19 @@ struct Identity {
   std::optional<Dictionary> userInfo;
 };
 
-enum class Command { session, send, states, displayURL, stats };
+enum class Command { session, send, oneShot, states, displayURL, stats };
 
 struct Options {
   Command command = Command::session;
   std::optional<std::string> root;  // absent: VELTRA_ROOT, else "/"
   bool json = false;
-  Identity identity;                 // all but stats
-  bool aggregate = false;            // session
-  std::optional<std::string> input;  // session: a file; absent: standard input
-  std::uint16_t category = 0;        // send, as are those that follow
-  std::uint16_t type = 0;
-  std::uint32_t flag = 0;
-  std::optional<Dictionary> payload;  // absent without KEY=VALUE
+  Identity identity;                  // all but stats
+  bool aggregate = false;             // session
+  std::optional<std::string> input;   // session: a file; absent: standard input
+  std::uint16_t category = 0;         // send, oneShot
+  std::uint16_t type = 0;             // likewise
+  std::uint32_t flag = 0;             // send
+  std::optional<Dictionary> payload;  // send, oneShot; absent without KEY=VALUE
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line.

@@ -1,4 +1,5 @@
-// `veltractl send`, `states` and `display-url`: one call in a session of its own. The main thread.
+// `veltractl send`, `one-shot`, `states` and `display-url`: one call on a connection of its own. The main
+// thread.
 #include "tools/ctl/send_command.h"
 
 #include "tools/ctl/client_session.h"
@@ -29,10 +30,26 @@ int failed(const std::optional<Answer>& answer) {
   return 1;
 }
 
+int finish(Operation operation, const std::optional<Answer>& answer) {
+  if (!answer) return failed(answer);
+  if (!printLine(formatAnswer(operation, *answer))) return 1;
+  return answer->status == VELTRA_OK ? 0 : failed(answer);
+}
+
+int runOneShot(const Options& options, ClientSession& session) {
+  if (const auto problem = session.openUndescribed(options.root)) {
+    complain(*problem);
+    return 1;
+  }
+  return finish(Operation::oneShot,
+                session.sendOneShot(options.identity, options.category, options.type, options.payload));
+}
+
 }  // namespace
 
 int runOneCall(const Options& options, Interrupt& interrupt) {
   ClientSession session(interrupt);
+  if (options.command == Command::oneShot) return runOneShot(options, session);
   if (const auto problem = session.open(options.root, options.identity)) {
     complain(*problem);
     return 1;
@@ -41,10 +58,7 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
   if (!started || started->status != VELTRA_OK) return failed(started);
   if (!started->backends)
     complain("Nothing reports for this client: the daemon has no configuration for its client type.");
-  const auto answer = call(session, options);
-  if (!answer) return failed(answer);
-  if (!printLine(formatAnswer(operationOf(options.command), *answer))) return 1;
-  return answer->status == VELTRA_OK ? 0 : failed(answer);
+  return finish(operationOf(options.command), call(session, options));
 }
 
 }  // namespace veltrad::ctl

@@ -1,4 +1,5 @@
-// `veltractl send`, `states` and `display-url`: one call in a session of its own. The main thread.
+// `veltractl send`, `one-shot`, `states` and `display-url`: one call on a connection of its own. The main
+// thread.
 #pragma once
 
 #include "tools/ctl/interrupt.h"

@@ -67,6 +67,8 @@ class SessionRun {
         return _session.start();
       case Operation::send:
         return _session.send(line.message);
+      case Operation::oneShot:
+        break;  // no line asks for it
       case Operation::flush:
         return _session.flush();
       case Operation::states:
