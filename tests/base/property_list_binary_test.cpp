@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <numeric>
 
 #include "base/property_list.h"
 #include "binary_list_builder.h"
@@ -18,33 +19,56 @@ using Kind = PropertyListError::Kind;
 
 TEST(BinaryPropertyList, readsEveryType) {
   const std::string long20(20, 'x');
-  const std::pair<std::string, Value> kObjects[] = {{"\x08", false},
-                                                    {"\x09", true},
-                                                    {"\x10\xFF", 255},
-                                                    {"\x11\xFF\xFE", 65534},
-                                                    {"\x12\xFF\xFF\xFF\xFF", 4294967295u},
-                                                    {"\x13" + bigEndian(~1ull, 8), -2},
-                                                    {"\x14" + bigEndian(0, 8) + bigEndian(~0ull, 8), ~0ull},
-                                                    {"\x14" + bigEndian(~0ull, 8) + bigEndian(~0ull, 8), -1},
-                                                    {"\x22\x3F\xC0\x00\x00"s, 1.5},
-                                                    {"\x23\xBF\xF8\x00\x00\x00\x00\x00\x00"s, -1.5},
-                                                    {"\x33" + std::string(8, '\0'), Date{978307200}},
-                                                    {"\x42\x00\xFF"s, Data{"\x00\xFF"s}},
-                                                    {ascii("abc"), "abc"},
-                                                    {"\x5F\x10\x14" + long20, long20},
-                                                    {"\x62\x00\xE9\x26\x03"s, "\u00e9\u2603"},
-                                                    {"\x62\xD8\x3D\xDE\x00"s, "\U0001F600"},
-                                                    {"\x62\xD8\x3D\x00\x41"s, "\uFFFD\x41"},
-                                                    {"\x61\xDE\x00"s, "\uFFFD"},
-                                                    {"\x81\x01\x02", 258u},
-                                                    {"\xA0", Array{}},
-                                                    {"\xC0", Array{}},
-                                                    {"\xD0", Dictionary{}}};
-  for (const auto& [bytes, value] : kObjects) {
-    const auto read = parsePropertyList(binaryList({bytes}));
-    ASSERT_TRUE(read.ok()) << read.error().detail;
-    EXPECT_TRUE(read.value() == value) << testing::PrintToString(bytes);
-  }
+  std::vector<std::string> objects{"\x08",
+                                   "\x09",
+                                   "\x10\xFF",
+                                   "\x11\xFF\xFE",
+                                   "\x12\xFF\xFF\xFF\xFF",
+                                   "\x13" + bigEndian(~1ull, 8),
+                                   "\x14" + bigEndian(0, 8) + bigEndian(~0ull, 8),
+                                   "\x14" + bigEndian(~0ull, 8) + bigEndian(~0ull, 8),
+                                   "\x22\x3F\xC0\x00\x00"s,
+                                   "\x23\xBF\xF8\x00\x00\x00\x00\x00\x00"s,
+                                   "\x33" + std::string(8, '\0'),
+                                   "\x42\x00\xFF"s,
+                                   ascii("abc"),
+                                   "\x5F\x10\x14" + long20,
+                                   "\x62\x00\xE9\x26\x03"s,
+                                   "\x62\xD8\x3D\xDE\x00"s,
+                                   "\x62\xD8\x3D\x00\x41"s,
+                                   "\x61\xDE\x00"s,
+                                   "\x81\x01\x02",
+                                   "\xA0",
+                                   "\xC0",
+                                   "\xD0"};
+  const Array values{false,
+                     true,
+                     255,
+                     65534,
+                     4294967295u,
+                     -2,
+                     ~0ull,
+                     -1,
+                     1.5,
+                     -1.5,
+                     Date{978307200},
+                     Data{"\x00\xFF"s},
+                     "abc",
+                     long20,
+                     "\u00e9\u2603",
+                     "\U0001F600",
+                     "\uFFFD\x41",
+                     "\uFFFD",
+                     258u,
+                     Array{},
+                     Array{},
+                     Dictionary{}};
+  std::vector<std::uint64_t> references(objects.size());
+  std::iota(references.begin(), references.end(), 1);
+  objects.insert(objects.begin(), container(0xA0, references.size(), references));
+  const auto all = parsePropertyList(binaryList(objects));
+  ASSERT_TRUE(all.ok()) << all.error().detail;
+  EXPECT_EQ(*all.value().asArray(), values);
   // A null entry is left out, a repeated key counts by its last value, a set is an array.
   const auto read = parsePropertyList(binaryList(
       {"\xD4" + bigEndian(0x0001'0002'0001'0003, 8) + bigEndian(0x0004'0005'0006'0007, 8), ascii("a"),
