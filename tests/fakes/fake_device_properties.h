@@ -19,17 +19,13 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
     const auto found = _values.find(key);
     return found == _values.end() ? std::nullopt : std::optional(found->second);
   }
-  void set(const std::string& key, const std::string& value) {
-    std::lock_guard lock(_mutex);
-    _values[key] = value;
-  }
   void remove(const std::string& key) {
     std::lock_guard lock(_mutex);
     _values.erase(key);
   }
-  void clear() {
+  void set(const std::string& key, const std::string& value) {
     std::lock_guard lock(_mutex);
-    _values.clear();
+    _values[key] = value;
   }
 
  private:

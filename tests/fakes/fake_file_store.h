@@ -19,13 +19,12 @@ class FakeFileStore final : public platform::FileStore {
   Result<std::string, platform::FileFailure> read(const std::string& path,
                                                   std::size_t most = 16u << 20) override {
     std::lock_guard lock(_mutex);
-    if (const auto failure = _readFailures.find(path); failure != _readFailures.end()) {
+    if (const auto failure = _readFailures.find(path); failure != _readFailures.end())
       return Failure{failureOf(path, failure->second)};
-    }
-    const auto file = _files.find(path);
-    if (file == _files.end()) return Failure{failureOf(path, Kind::notFound)};
-    if (file->second.bytes.size() > most) return Failure{failureOf(path, Kind::tooLarge)};
-    return file->second.bytes;
+    const File* file = find(path);
+    if (!file) return Failure{failureOf(path, Kind::notFound)};
+    if (file->bytes.size() > most) return Failure{failureOf(path, Kind::tooLarge)};
+    return file->bytes;
   }
   std::optional<platform::FileFailure> replace(const std::string& path, std::string_view bytes,
                                                unsigned mode = 0600) override {
@@ -38,16 +37,16 @@ class FakeFileStore final : public platform::FileStore {
   std::optional<platform::FileFailure> rename(const std::string& from, const std::string& to) override {
     std::lock_guard lock(_mutex);
     if (_writeFailure) return failureOf(from, *_writeFailure);
-    const auto file = _files.find(from);
-    if (file == _files.end()) return failureOf(from, Kind::notFound);
-    _files[to] = file->second;
+    const File* file = find(from);
+    if (!file) return failureOf(from, Kind::notFound);
+    _files[to] = *file;
     _files.erase(from);
     return std::nullopt;
   }
   std::optional<std::uint64_t> stamp(const std::string& path) override {
     std::lock_guard lock(_mutex);
-    const auto file = _files.find(path);
-    return file == _files.end() ? std::nullopt : std::optional(file->second.stamp);
+    const File* file = find(path);
+    return file ? std::optional(file->stamp) : std::nullopt;
   }
 
   // What somebody else does to the disk; never fails.
@@ -61,26 +60,18 @@ class FakeFileStore final : public platform::FileStore {
   }
   std::optional<std::string> bytes(const std::string& path) const {
     std::lock_guard lock(_mutex);
-    const auto file = _files.find(path);
-    return file == _files.end() ? std::nullopt : std::optional(file->second.bytes);
+    const File* file = find(path);
+    return file ? std::optional(file->bytes) : std::nullopt;
   }
   unsigned mode(const std::string& path) const {
     std::lock_guard lock(_mutex);
-    const auto file = _files.find(path);
-    return file == _files.end() ? 0 : file->second.mode;
+    return find(path) ? find(path)->mode : 0;
   }
-  int replaced() const {
-    std::lock_guard lock(_mutex);
-    return _replaced;
-  }
+  int replaced() const { return _replaced; }
 
-  // From now on; nothing: all is well again.
-  void failWrites(std::optional<Kind> kind) {
-    std::lock_guard lock(_mutex);
-    _writeFailure = kind;
-  }
+  // From now on; nothing: all is well again. While no other thread uses it.
+  void failWrites(std::optional<Kind> kind) { _writeFailure = kind; }
   void failReads(const std::string& path, std::optional<Kind> kind) {
-    std::lock_guard lock(_mutex);
     _readFailures.erase(path);
     if (kind) _readFailures.emplace(path, *kind);
   }
@@ -92,6 +83,10 @@ class FakeFileStore final : public platform::FileStore {
     std::uint64_t stamp = 0;
   };
 
+  const File* find(const std::string& path) const {
+    const auto file = _files.find(path);
+    return file == _files.end() ? nullptr : &file->second;
+  }
   static platform::FileFailure failureOf(const std::string& path, Kind kind) {
     static const char* const kTexts[] = {"No such file or directory", "Permission denied",
                                          "larger than was asked for", "No space left on device",

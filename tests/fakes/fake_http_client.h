@@ -21,16 +21,9 @@ namespace veltrad {
 // `stopping`.
 class FakeHTTPClient final : public platform::HTTPClient {
  public:
-  class Held {
-   public:
-    const platform::HTTPRequest request;
-
-    Held(platform::HTTPRequest asked, platform::HTTPCompletion completion)
-        : request(std::move(asked)), _completion(std::move(completion)) {}
-
-   private:
-    friend class FakeHTTPClient;
-    platform::HTTPCompletion _completion;
+  struct Held {
+    platform::HTTPRequest request;
+    platform::HTTPCompletion completion;  // run by answer() alone
   };
   using HeldRequest = std::shared_ptr<Held>;
   using Answerer = std::function<platform::HTTPResult(const platform::HTTPRequest&)>;
@@ -50,14 +43,10 @@ class FakeHTTPClient final : public platform::HTTPClient {
                                     std::string description = "The daemon is stopping") {
     return Failure{platform::HTTPError{kind, std::move(description)}};
   }
-  static platform::HTTPResult transportError(
-      std::string description = "Could not resolve host: host.invalid") {
-    return error(platform::HTTPError::Kind::transport, std::move(description));
-  }
 
   void start(platform::HTTPRequest request, platform::HTTPCompletion completion) override {
     const std::lock_guard lock(_mutex);
-    _held.push_back(std::make_shared<Held>(std::move(request), std::move(completion)));
+    _held.push_back(std::make_shared<Held>(Held{std::move(request), std::move(completion)}));
     _changed.notify_all();
   }
 
@@ -85,7 +74,7 @@ class FakeHTTPClient final : public platform::HTTPClient {
       const std::lock_guard lock(_mutex);
       if (std::erase(_held, held) != 1) std::abort();
     }
-    std::exchange(held->_completion, nullptr)(std::move(result));
+    std::exchange(held->completion, nullptr)(std::move(result));
   }
   // The oldest one; false when none came in time.
   bool answerNext(platform::HTTPResult result, std::chrono::milliseconds within = std::chrono::seconds(10)) {

@@ -13,6 +13,7 @@
 #include "fakes/fake_random.h"
 #include "platform/counters.h"
 #include "platform/root.h"
+#include "platform/work_pool.h"
 #include "protocol/veltra.h"
 #include "support/device_identity.h"
 
@@ -32,12 +33,13 @@ struct World {
   FakeDeviceProperties properties;
   FakeFileStore files;
   platform::Counters counters;
+  platform::WorkPool pool;
   platform::Root root{"/"};
   DeviceIdentity device{properties};
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra library{files, preferences, root};
   StandardBackendFactory factory{
-      {http, clock, random, locale, preferences, counters, settings, device, library}};
+      {http, clock, random, locale, preferences, counters, settings, device, library, pool}};
 
   void consent() { preferences.set("DiagnosticLogSubmissionEnabled", true); }
 };
