@@ -252,35 +252,30 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
   }
   platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
-  _services.http.start(std::move(request), [self, eventCount, completion = std::move(completion)](
-                                               const platform::HTTPResult& result) {
-    self->handleAnswer(result, eventCount, completion);
-  });
+  _services.http.start(std::move(request),
+                       [self, postedTo = *url, eventCount,
+                        completion = std::move(completion)](const platform::HTTPResult& result) {
+                         auto error = self->handleAnswer(result, postedTo, eventCount);
+                         if (completion) completion(std::nullopt, std::move(error));
+                       });
 }
 
-void HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result, std::size_t eventCount,
-                                    const FlushCompletion& completion) {
-  std::optional<ReportingError> error;
-  int status = 0;
-  if (result.ok()) {
-    status = result.value().status;
-  } else {
-    logError("HTTPSPostBackend(postJsonMessage): post error: %s", result.error().description.c_str());
-    error = makeReportingError(result.error().description, -1);
+std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result,
+                                                             const std::string& url, std::size_t eventCount) {
+  if (!result.ok()) {
+    const std::string& description = result.error().description;
+    logError("HTTPSPostBackend(postJsonMessage): post error: %s (%s)", description.c_str(), url.c_str());
     _services.counters.count(reasonOf(result.error().kind), eventCount);
+    return makeReportingError(description, -1);
   }
+  const int status = result.value().status;
   const PostVerdict verdict = verdictOfStatus(status);
-  if (verdict.disablesBackend) {
-    const std::string text =
-        fmt::sprintf("backend %s disabled by server %d return code", name(), verdict.status);
-    logInfo("postJSONMessage: %s", text.c_str());
-    setState(kBackendDisabled);
-    error = makeReportingError(text, verdict.status);
-    _services.counters.count("event lost: the server answered 5xx", eventCount);
-  } else if (result.ok()) {
-    _services.counters.count("event posted", eventCount);
-  }
-  if (completion) completion(std::nullopt, std::move(error));
+  _services.counters.count(verdict.reason, eventCount);
+  if (!verdict.disablesBackend) return std::nullopt;
+  const std::string text = fmt::sprintf("backend %s disabled by server %d return code", name(), status);
+  logInfo("postJSONMessage: %s", text.c_str());
+  setState(kBackendDisabled);
+  return makeReportingError(text, status);
 }
 
 }  // namespace veltrad

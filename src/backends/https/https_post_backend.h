@@ -65,8 +65,9 @@ class HTTPSPostBackend final : public VeltraBackend {
   bool loggingAllowed() const;
   void postJSONMessage(std::string json, std::int32_t withFlag, std::optional<EventMap> eventMap,
                        std::size_t eventCount, FlushCompletion completion);
-  void handleAnswer(const platform::HTTPResult& result, std::size_t eventCount,
-                    const FlushCompletion& completion);
+  // HTTP thread. Nothing: the post ended without an error.
+  std::optional<ReportingError> handleAnswer(const platform::HTTPResult& result, const std::string& url,
+                                             std::size_t eventCount);
 
   // Constant after construction.
   const BackendServices _services;

@@ -85,7 +85,10 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
   }
   if (entry) applyExpedite(*entry);
   if (!requireUserInfo()) return reportForEveryone(*clients);
-  if (!userInfo) return kBackendWaiting;
+  if (!userInfo) {
+    _services.counters.count("back end waiting: user info is required, and there is none");
+    return kBackendWaiting;
+  }
   if (!entry) {
     _services.counters.count("back end disabled: no client entry fits");
     return kBackendDisabled;
@@ -119,6 +122,8 @@ std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
     logRefusal(entry, verdict, country);
     _services.counters.count(reasonOf(verdict.refusal));
   }
+  if (verdict.state == kBackendHeld)
+    _services.counters.count("back end held: sampled out, may be overridden");
   if (!verdict.samplingReached) return kBackendDisabled;
 
   resetBackendStateWithClient(&entry);

@@ -53,7 +53,18 @@ platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string 
 }
 
 PostVerdict verdictOfStatus(int status) {
-  return {status >= 500 && status <= 599, status};
+  switch (status / 100) {
+    case 2:
+      return {false, "event posted"};
+    case 3:
+      return {false, "event lost: the server answered 3xx, and no post follows a redirect"};
+    case 4:
+      return {false, "event lost: the server answered 4xx"};
+    case 5:
+      return {true, "event lost: the server answered 5xx"};
+    default:
+      return {false, "event lost: the server answered with an unknown status"};
+  }
 }
 
 }  // namespace veltrad

@@ -22,10 +22,10 @@ struct EventMap {
 platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
                                       std::optional<EventMap> eventMap);
 
-// What an answer means for the backend.
+// What an answer's status means for the backend and for the events of the post.
 struct PostVerdict {
   bool disablesBackend;  // 5xx
-  int status;            // 0 when no answer came
+  const char* reason;    // the counter's text
 };
 PostVerdict verdictOfStatus(int status);
 
