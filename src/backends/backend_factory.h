@@ -18,6 +18,7 @@ class Counters;
 class HTTPClient;
 class Locale;
 class Preferences;
+class WorkPool;
 }  // namespace platform
 
 // What the kinds of backends use; each takes its own few. Everything outlives the backends.
@@ -31,6 +32,7 @@ struct BackendServices {
   ProcessSettings& settings;
   DeviceIdentity& device;
   const Veltra& library;
+  platform::WorkPool& pool;
 };
 
 class BackendFactory {

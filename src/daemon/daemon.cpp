@@ -9,7 +9,7 @@ Daemon::Daemon(platform::Services& services)
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
       _messageLog(services.clock, services.root.messageLogDirectory()),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
-                services.counters, _settings, _device, _library}),
+                services.counters, _settings, _device, _library, services.pool}),
       _storebags(services.http, _settings, _library),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
               services.counters, _flushes, _messageLog},

@@ -74,13 +74,14 @@ void serve(platform::Services& services, platform::RunLoop& loop) {
   });
 }
 
-// The listener first, so that every session sends its stop message; then what is still to be posted.
+// The listener first, so that every session sends its stop message; then what is still to be posted or sent.
 std::size_t stop(platform::Services& services, Listener& listener) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
   const std::size_t stuck = listener.invalidate(deadline - 1s);
   services.http.drain(deadline - 500ms);
+  services.pool.drain(deadline - 300ms);
   return stuck;
 }
 
@@ -111,6 +112,7 @@ int main() {
   serve(services, loop);
 
   const std::size_t stuck = stop(services, listener);
+  if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited
   services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
   if (stuck > 0) {
     logWarning("main: %zu calls did not end within the time of a stop", stuck);

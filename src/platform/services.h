@@ -13,6 +13,7 @@
 #include "platform/root.h"
 #include "platform/service_manager.h"
 #include "platform/transaction.h"
+#include "platform/work_pool.h"
 
 namespace veltrad::platform {
 
@@ -38,6 +39,7 @@ struct Services {
   ServiceTransaction transaction;
   Counters counters;
   CurlHTTPClient http;
+  WorkPool pool;
 };
 
 }  // namespace veltrad::platform

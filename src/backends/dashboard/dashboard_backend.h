@@ -1,0 +1,74 @@
+// DashboardBackend: every message is one UDP datagram for a dashboard and one text line for its sender. The
+// session's thread sends and uploads; what waits then is the work pool's (network_proc_queue.h).
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "backends/backend.h"
+#include "backends/backend_factory.h"
+#include "backends/dashboard/network_proc_queue.h"
+#include "backends/dashboard/reporting_packet.h"
+
+namespace veltrad {
+
+// Null from an initialiser: it cannot work so; one error line has said why.
+class DashboardBackend final : public VeltraBackend {
+ public:
+  // From a storebag's section: "ip" (dotted-decimal IPv4), "port", and where given "display_url", "post_url"
+  // (for log data) and "reliable": present switches acknowledgements on; its value, from 1 on, is the period
+  // of the ticks in milliseconds, else 500.
+  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
+                                                        const std::string& name, const Dictionary* profile,
+                                                        const std::string& productFamily);
+  // To a server named outright, with acknowledgements and a period of 500 ms.
+  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
+                                                        const std::string& name,
+                                                        const std::optional<std::string>& serverIP,
+                                                        std::uint16_t serverPort,
+                                                        const std::string& productFamily);
+  // A profile goes before the server named.
+  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
+                                                        const std::string& name, const Dictionary* profile,
+                                                        const std::optional<std::string>& serverIP,
+                                                        std::uint16_t serverPort,
+                                                        const std::string& productFamily);
+  ~DashboardBackend() override;
+
+  using VeltraBackend::sendMessage;
+  // The dashboard text line of the message.
+  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
+                                         std::int32_t flag) override;
+  bool uploadLogData(const Array& logData) override;
+  void cleanup() override;
+
+ private:
+  struct Network {
+    std::shared_ptr<NetworkProcQueue> queue;
+    bool reliableUDP = false;
+  };
+
+  DashboardBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
+                   const std::string& productFamily, Network network);
+
+  static std::optional<Network> openNetwork(const BackendServices& services, const Dictionary* profile,
+                                            const std::optional<std::string>& serverIP,
+                                            std::uint16_t serverPort);
+  static bool useReliableUDP(platform::UDPSocket& socket);
+  tagReportingPacketHeader headerOf(platform::TimeValue timestamp, std::uint16_t method,
+                                    std::uint16_t respCode, std::uint16_t eventID) const;
+
+  // Constant after construction.
+  platform::HTTPClient& _http;
+  platform::Clock& _clock;
+  platform::Counters& _counters;
+  const bool _reliableUDP;
+  const bool _usingProfile;
+  const std::optional<std::string> _postURL;
+  const std::shared_ptr<NetworkProcQueue> _networkProcQueue;
+};
+
+}  // namespace veltrad

@@ -1,0 +1,68 @@
+// The items of a payload, ordered, escaped and cut.
+#include "backends/dashboard/packet_text.h"
+
+#include <algorithm>
+#include <cstring>
+#include <vector>
+
+#include "backends/dashboard/value_description.h"
+
+namespace veltrad {
+
+namespace {
+struct Item {
+  const std::string* key;
+  ValueDescription value;
+};
+
+std::vector<Item> itemsInOrder(const Dictionary& payload) {
+  std::vector<Item> items;
+  items.reserve(payload.size());
+  for (const auto& [key, value] : payload) items.push_back({&key, descriptionForObject(value)});
+  std::sort(items.begin(), items.end(), [](const Item& a, const Item& b) {
+    const std::size_t lengthA = a.value.characters();
+    const std::size_t lengthB = b.value.characters();
+    return lengthA != lengthB ? lengthA < lengthB : *a.key < *b.key;
+  });
+  return items;
+}
+
+// The field is a NUL-terminated text, so a NUL ends what is put into it.
+std::string_view untilNUL(std::string_view text) {
+  return text.substr(0, text.find('\0'));
+}
+}  // namespace
+
+void PacketText::append(const Dictionary& payload) {
+  for (const Item& item : itemsInOrder(payload)) {
+    put(" ");
+    put(untilNUL(*item.key));
+    put("=");
+    sanitize(item.value.text());
+    if (_cut) return;
+  }
+}
+
+void PacketText::sanitize(std::string_view text) {
+  if (text.find_first_not_of('\n') == std::string_view::npos) return put("empty");
+  text = untilNUL(text);
+  while (!text.empty() && !_cut) {
+    const std::size_t plain = std::min(text.find_first_of("\n\\="), text.size());
+    put(text.substr(0, plain));
+    text.remove_prefix(plain);
+    if (text.empty()) return;
+    if (text.front() == '\\') put("\\\\");
+    if (text.front() == '=') put("\\=");
+    text.remove_prefix(1);
+  }
+}
+
+void PacketText::put(std::string_view text) {
+  const std::size_t fits = std::min(text.size(), kSize - 1 - _length);
+  std::memcpy(_field + _length, text.data(), fits);
+  _length += fits;
+  _field[_length] = '\0';
+  _cut = _cut || fits < text.size();
+}
+
+}  // namespace veltrad

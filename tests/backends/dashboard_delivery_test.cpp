@@ -1,0 +1,131 @@
+// What becomes of a dashboard datagram after its first transmission, on ticks and a time that the test sets.
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <set>
+#include <string>
+#include <vector>
+
+#include "backends/dashboard/delivery_schedule.h"
+#include "backends/dashboard/message_queue.h"
+
+namespace veltrad {
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::ElementsAre;
+using Verdict = DeliverySchedule::Verdict;
+
+// A network that takes datagrams on some ticks only; the first transmission is tick 0.
+struct Network {
+  explicit Network(std::set<int> closedAt) : closed(std::move(closedAt)) {}
+  const std::set<int> closed;
+  int now = 0;
+  std::vector<int> sentAt;
+  std::vector<std::string> sent;
+
+  MessageQueue::Send send() {
+    return [this](std::string_view datagram) {
+      if (closed.contains(now)) return false;
+      sentAt.push_back(now);
+      sent.emplace_back(datagram);
+      return true;
+    };
+  }
+};
+
+TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
+  struct Case {
+    bool reliable;
+    std::set<int> closed;
+    std::vector<int> sentAt;
+    int leavesAt;  // 0: never waited
+    std::size_t givenUp;
+  };
+  for (const Case& c :
+       std::vector<Case>{{true, {}, {0, 2, 5, 10, 19}, 20, 1},
+                         {true, {2, 3}, {0, 4, 7, 12, 21}, 22, 1},     // a retransmission is tried again
+                         {true, {0, 1, 2}, {3, 5, 8, 13, 22}, 23, 1},  // counted from the first that went out
+                         {false, {}, {0}, 0, 0},                       // sent is done
+                         {false, {0, 1, 2}, {3}, 3, 0}}) {
+    Network network(c.closed);
+    MessageQueue queue(c.reliable, network.send());
+    EXPECT_EQ(queue.tryToSendMsg("datagram", 1).sent, !c.closed.contains(0));
+    std::size_t givenUp = 0;
+    while (!queue.empty() && network.now < 100) {
+      ++network.now;
+      givenUp += queue.tick().givenUp;
+    }
+    EXPECT_EQ(network.sentAt, c.sentAt);
+    EXPECT_EQ(network.now, c.leavesAt);
+    EXPECT_EQ(givenUp, c.givenUp);
+  }
+}
+
+TEST(DashboardDelivery, FiftyWaitAndTheOldestMakesRoom) {
+  Network network({0});
+  MessageQueue queue(false, network.send());
+  for (std::uint16_t event = 0; event <= 50; ++event) {
+    EXPECT_EQ(queue.tryToSendMsg(std::to_string(event), event).pushedOut, event == 50);
+  }
+  ++network.now;
+  EXPECT_EQ(queue.tick().sent, 50u);
+  EXPECT_EQ(network.sent.front(), "1");
+  EXPECT_EQ(network.sent.back(), "50");
+  EXPECT_TRUE(queue.empty());
+}
+
+TEST(DashboardDelivery, AnAcknowledgementRemovesTheOldestOfItsNumber) {
+  Network network({1});
+  MessageQueue queue(true, network.send());
+  for (const char* datagram : {"older", "other", "newer"}) {
+    queue.tryToSendMsg(datagram, datagram == std::string("other") ? 8 : 7);  // 7 has come round again
+  }
+  ++network.now;
+  queue.tryToSendMsg("not sent yet", 9);
+  EXPECT_FALSE(queue.acknowledge(6));
+  EXPECT_TRUE(queue.acknowledge(7));
+  EXPECT_TRUE(queue.acknowledge(9));
+  network.sent.clear();
+  for (int i = 0; i < 2; ++i) ++network.now, queue.tick();
+  EXPECT_THAT(network.sent, ElementsAre("other", "newer"));
+}
+
+TEST(DashboardDelivery, TicksStandAtMultiplesAndOnlyWhileSomethingWaits) {
+  const DeliverySchedule::Time made{1h};
+  DeliverySchedule schedule(made, 250ms);
+  EXPECT_EQ(schedule.next(made + 10ms, false), std::nullopt);
+  EXPECT_FALSE(schedule.tickIsDue(made + 1h));
+  for (const auto& [now, next] : std::vector<std::pair<std::chrono::milliseconds, std::chrono::milliseconds>>{
+           {0ms, 250ms}, {249ms, 250ms}, {250ms, 500ms}, {3600'001ms, 3600'250ms}}) {
+    EXPECT_EQ(schedule.next(made + now, true), made + next);
+    EXPECT_FALSE(schedule.tickIsDue(made + next - 1ms));
+    EXPECT_TRUE(schedule.tickIsDue(made + next));
+  }
+}
+
+TEST(DashboardDelivery, CleanUpWaitsForDatagramsUntilTheLastResort) {
+  const DeliverySchedule::Time made{};
+  DeliverySchedule idle(made, 500ms);
+  EXPECT_EQ(idle.cleanup(false), Verdict::stop);
+
+  for (const bool drains : {true, false}) {
+    DeliverySchedule schedule(made, 500ms);
+    EXPECT_EQ(schedule.afterTick(made + 500ms, false), Verdict::goOn);
+    EXPECT_EQ(schedule.cleanup(true), Verdict::goOn);
+    // Acknowledged since: the next tick still comes, to stop.
+    EXPECT_EQ(schedule.next(made + 600ms, false), made + 1000ms);
+    EXPECT_EQ(schedule.afterTick(made + 1000ms, true), Verdict::lastResortScheduled);
+    EXPECT_EQ(schedule.afterTick(made + 1500ms, true), Verdict::goOn);
+    if (drains) {
+      EXPECT_EQ(schedule.afterTick(made + 2000ms, false), Verdict::stop);
+    } else {
+      EXPECT_FALSE(schedule.lastResortIsDue(made + 10'499ms));
+      EXPECT_EQ(schedule.next(made + 10'400ms, true), made + 10'500ms);
+      EXPECT_TRUE(schedule.lastResortIsDue(made + 10'500ms));
+    }
+  }
+}
+
+}  // namespace
+}  // namespace veltrad
