@@ -1,5 +1,6 @@
 """The HTTPS post back end: client entries, filters, batches, collectors with moods, hostile texts, the message log."""
 import collections
+import contextlib
 import datetime
 import hashlib
 import itertools
@@ -9,6 +10,9 @@ import pathlib
 import plistlib
 import re
 import shutil
+import socket
+import ssl
+import threading
 
 from harness import BUILD, DEVICE, Lab, SystemTest, Wire, closed_port, storebag, wait_until
 
@@ -468,3 +472,60 @@ class Moods(HTTPSTest):
                       "event lost: the post failed": 3 * 2 + 3 * 4, "event held: batched": 12 * 4}
             wait_until(lambda: counts.items() <= self.stats().items(), counts)
         self.assertEqual((self.posts("elsewhere"), stranger.received("events")), ([], []))
+
+
+class ClosingCollector:
+    """Answers one post a connection with 200, does not say that it closes, and closes, as a server does that has waited
+    long enough."""
+
+    def __init__(self, lab):
+        self.posts, self._closed = 0, threading.Semaphore(0)
+        self._tls = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+        self._tls.load_cert_chain(lab.certificate, lab.certificate.replace("certificate.pem", "certificate-key.pem"))
+        self._listening = socket.create_server(("localhost", 0))
+        self.url = f"https://localhost:{self._listening.getsockname()[1]}/events"
+        threading.Thread(target=self._serve, daemon=True).start()
+
+    def _serve(self):
+        while True:
+            try:
+                connection = self._tls.wrap_socket(self._listening.accept()[0], server_side=True)
+            except OSError:
+                return
+            head, _, body = self._read(connection, b"").partition(b"\r\n\r\n")
+            length = int(re.search(rb"Content-Length: (\d+)", head)[1])
+            while len(body) < length:
+                body = self._read(connection, body)
+            self.posts += 1
+            connection.sendall(b"HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n")
+            connection.setblocking(False)
+            with contextlib.suppress(ssl.SSLWantReadError):
+                connection.unwrap()  # the closing alert; the client's own is not waited for
+            connection.close()
+            self._closed.release()
+
+    @staticmethod
+    def _read(connection, so_far):
+        return so_far + connection.recv(65536)
+
+    def wait_for_close(self):
+        assert self._closed.acquire(timeout=20)
+
+    def stop(self):
+        self._listening.shutdown(socket.SHUT_RDWR)
+        self._listening.close()
+
+
+class KeptConnections(HTTPSTest):
+    def test_no_post_is_lost_to_a_connection_that_its_server_closed(self):
+        collector = ClosingCollector(self.lab)
+        self.addCleanup(collector.stop)
+        self.serve(entry(post_url=collector.url))
+        with self.serving():
+            client = self.client(batchEvent=True)
+            for _ in range(4):
+                client.message()
+                self.assertEqual(client.flush()[1:], (None, None))
+                collector.wait_for_close()
+            client.close()
+        self.assertEqual((collector.posts, self.counts()["event posted"]), (5, 6))
