@@ -3,7 +3,9 @@
 
 #include <cmath>
 #include <numeric>
+#include <sstream>
 
+#include "base/json.h"
 #include "base/property_list.h"
 #include "binary_list_builder.h"
 
@@ -18,57 +20,24 @@ using test::container;
 using Kind = PropertyListError::Kind;
 
 TEST(BinaryPropertyList, readsEveryType) {
-  const std::string long20(20, 'x');
-  std::vector<std::string> objects{"\x08",
-                                   "\x09",
-                                   "\x10\xFF",
-                                   "\x11\xFF\xFE",
-                                   "\x12\xFF\xFF\xFF\xFF",
-                                   "\x13" + bigEndian(~1ull, 8),
-                                   "\x14" + bigEndian(0, 8) + bigEndian(~0ull, 8),
-                                   "\x14" + bigEndian(~0ull, 8) + bigEndian(~0ull, 8),
-                                   "\x22\x3F\xC0\x00\x00"s,
-                                   "\x23\xBF\xF8\x00\x00\x00\x00\x00\x00"s,
-                                   "\x33" + std::string(8, '\0'),
-                                   "\x42\x00\xFF"s,
-                                   ascii("abc"),
-                                   "\x5F\x10\x14" + long20,
-                                   "\x62\x00\xE9\x26\x03"s,
-                                   "\x62\xD8\x3D\xDE\x00"s,
-                                   "\x62\xD8\x3D\x00\x41"s,
-                                   "\x61\xDE\x00"s,
-                                   "\x81\x01\x02",
-                                   "\xA0",
-                                   "\xC0",
-                                   "\xD0"};
-  const Array values{false,
-                     true,
-                     255,
-                     65534,
-                     4294967295u,
-                     -2,
-                     ~0ull,
-                     -1,
-                     1.5,
-                     -1.5,
-                     Date{978307200},
-                     Data{"\x00\xFF"s},
-                     "abc",
-                     long20,
-                     "\u00e9\u2603",
-                     "\U0001F600",
-                     "\uFFFD\x41",
-                     "\uFFFD",
-                     258u,
-                     Array{},
-                     Array{},
-                     Dictionary{}};
-  std::vector<std::uint64_t> references(objects.size());
-  std::iota(references.begin(), references.end(), 1);
-  objects.insert(objects.begin(), container(0xA0, references.size(), references));
-  const auto all = parsePropertyList(binaryList(objects));
+  std::istringstream hex(
+      "08 09 10FF 11FFFE 12FFFFFFFF 13FFFFFFFFFFFFFFFE 140000000000000000FFFFFFFFFFFFFFFF "
+      "14FFFFFFFFFFFFFFFFFFFFFFFFFFFFFFFF 223FC00000 23BFF8000000000000 330000000000000000 4200FF 53616263 "
+      "5F100F616161616161616161616161616161 6200E92603 62D83DDE00 62D83D0041 61DE00 810102 A0 C0 D0");
+  std::vector<std::string> objects{""};
+  for (std::string digits; hex >> digits; objects.push_back({}))
+    for (std::size_t i = 0; i < digits.size(); i += 2)
+      objects.back() += static_cast<char>(std::stoi(digits.substr(i, 2), nullptr, 16));
+  std::vector<std::uint64_t> references(objects.size() - 1);
+  std::iota(references.begin(), references.end(), 0);
+  objects.back() = container(0xA0, references.size(), references);
+  const auto bytes = binaryList(objects, [&](test::Trailer& trailer) { trailer.top = references.size(); });
+  const auto all = parsePropertyList(bytes);
   ASSERT_TRUE(all.ok()) << all.error().detail;
-  EXPECT_EQ(*all.value().asArray(), values);
+  EXPECT_EQ(writeJSON(all.value()),
+            R"([false,true,255,65534,4294967295,-2,18446744073709551615,-1,1.5,-1.5,{"$date":978307200.0},)"
+            R"({"$data":"AP8="},"abc","aaaaaaaaaaaaaaa","é☃",)"
+            "\"\U0001F600\",\"\uFFFDA\",\"\uFFFD\",258,[],[],{}]");
   // A null entry is left out, a repeated key counts by its last value, a set is an array.
   const auto read = parsePropertyList(binaryList(
       {"\xD4" + bigEndian(0x0001'0002'0001'0003, 8) + bigEndian(0x0004'0005'0006'0007, 8), ascii("a"),
