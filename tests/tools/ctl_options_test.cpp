@@ -2,6 +2,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include "base/json.h"
 #include "tools/ctl/key_value.h"
 #include "tools/ctl/options.h"
 
@@ -32,12 +33,8 @@ Parsed parsed(const std::string& line) {
 
 TEST(Options, sessionSaysWhoTheClientIs) {
   const Options options = parsed<Options>(
-      "--root /r session --client-type=-17 --session-id 4294967295 --client-version 65535 --client 123 "
-      "--service ringer --user-info build=7 region=EU --require-user-info --batch-events --aggregate "
-      "--input lines.jsonl");
-  EXPECT_EQ(options.command, Command::session);
-  EXPECT_EQ(options.root, "/r");
-  EXPECT_EQ(options.input, "lines.jsonl");
+      "session --client-type=-17 --session-id 4294967295 --client-version 65535 --client 123 "
+      "--service ringer --user-info build=7 region=EU --require-user-info --batch-events --aggregate");
   EXPECT_EQ(options.identity.clientType, -17);
   EXPECT_EQ(options.identity.sessionID, 4294967295u);
   EXPECT_EQ(options.identity.clientVersion, 65535);
@@ -45,27 +42,19 @@ TEST(Options, sessionSaysWhoTheClientIs) {
   // A name is a text whatever it looks like.
   EXPECT_EQ(options.identity.userInfo,
             Dictionary({{"clientName", "123"}, {"serviceName", "ringer"}, {"build", 7}, {"region", "EU"}}));
-
-  const Options bare = parsed<Options>("session");
-  EXPECT_FALSE(bare.root || bare.input || bare.identity.clientType || bare.identity.sessionID);
-  EXPECT_FALSE(bare.identity.clientVersion || bare.identity.userInfo || bare.identity.requireUserInfo);
-  EXPECT_FALSE(bare.identity.batchEvents || bare.aggregate);
 }
 
 TEST(Options, otherCommandsTakeTheirs) {
   const Options send = parsed<Options>(
       "send --category 65535 codec=opus --type 0 --flag 3 --user-info region=EU seconds=12.5 "
       "--client-type=7");
-  EXPECT_EQ(send.command, Command::send);
   EXPECT_EQ(send.category, 65535);
   EXPECT_EQ(send.type, 0);
   EXPECT_EQ(send.flag, 3u);
   EXPECT_EQ(send.payload, Dictionary({{"codec", "opus"}, {"seconds", 12.5}}));
   EXPECT_EQ(send.identity.userInfo, Dictionary({{"region", "EU"}}));
-  EXPECT_FALSE(parsed<Options>("send --category 1 --type 2").payload);
   const Options oneShot =
       parsed<Options>("one-shot --category 5 --type 1 codec=opus --user-info a=1 b=2 --session-id 42");
-  EXPECT_EQ(oneShot.command, Command::oneShot);
   EXPECT_EQ(oneShot.payload, Dictionary({{"codec", "opus"}, {"b", 2}}));
   EXPECT_EQ(oneShot.identity.userInfo, Dictionary({{"a", 1}}));
   for (const char* line : {"--json --root there stats", "stats --json --root there"}) {
@@ -74,8 +63,6 @@ TEST(Options, otherCommandsTakeTheirs) {
     EXPECT_TRUE(stats.json);
     EXPECT_EQ(stats.root, "there");
   }
-  EXPECT_EQ(parsed<Options>("states").command, Command::states);
-  EXPECT_EQ(parsed<Options>("display-url").command, Command::displayURL);
 }
 
 TEST(Options, wrongUsageSaysWhatWasExpected) {
@@ -85,18 +72,13 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
        "unknown command \"explode\": expected session, send, one-shot, states, display-url or stats"},
       {"--explode", "unknown option \"--explode\""},
       {"session stats", "\"stats\" is not expected here"},
-      {"states --aggregate", "\"--aggregate\" is not expected here"},
       {"session --client-type 2147483648", "from -2147483648 to 2147483647, found \"2147483648\""},
-      {"session --client-type 0x7",
-       "--client-type: expected an integer from -2147483648 to 2147483647, found"},
       {"session --session-id=-1", "from 0 to 4294967295, found \"-1\""},
-      {"session --session-id 4294967296", "from 0 to 4294967295, found \"4294967296\""},
       {"session --client-version 65536", "from 0 to 65535, found \"65536\""},
       {"session --user-info novalue", "\"novalue\": expected KEY=VALUE"},
       {"session --client \xff", "expected UTF-8"},
       {"session --root ", "--root: expected a directory"},
       {"send --type 1", "--category is required"},
-      {"send --category 1", "--type is required"},
       {"send --category x --type 1", "--category: expected an integer from 0 to 65535, found \"x\""},
       {"one-shot --category 1 --type 1 --flag=1", "\"--flag=1\" is not expected here"},
       {"send --category 1 --type 1 =x", "\"=x\": expected KEY=VALUE"},
@@ -119,17 +101,10 @@ TEST(Options, helpHasAnExampleAndOffersWhatThereIs) {
 }
 
 TEST(KeyValue, numbersAndBooleansAreToldFromTexts) {
-  const std::pair<const char*, Value> values[] = {{"12", 12},
-                                                  {"-3", -3},
-                                                  {"-0.5", -0.5},
-                                                  {"1e3", 1000.0},
-                                                  {"18446744073709551615", 18446744073709551615ull},
-                                                  {"true", true},
-                                                  {"false", false}};
-  for (const auto& [text, value] : values) {
-    const Value found = parseKeyValue(std::string("k=") + text).value().second;
-    EXPECT_TRUE(found.type() == value.type() && found == value) << text;
-  }
+  Array found;
+  for (const char* text : {"12", "-3", "-0.5", "1e3", "18446744073709551615", "true", "false"})
+    found.push_back(parseKeyValue(std::string("k=") + text).value().second);
+  EXPECT_EQ(writeJSON(found), "[12,-3,-0.5,1000.0,18446744073709551615,true,false]");
   for (const char* text :
        {"True", "007", "+5", " 5", "1.", "8.0.1", "-", "", "a=b", "null", "{}", "NaN", "0x10"})
     EXPECT_EQ(parseKeyValue(std::string("k=") + text).value(), Dictionary::Entry("k", text));
