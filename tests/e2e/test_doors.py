@@ -113,8 +113,9 @@ class Doors(SystemTest):
             listener.listen(5)
             waiting = Wire.__new__(Wire)  # connects before the daemon is there
             with self.serving(wrapper=(sys.executable, "-c", wrapper, str(listener.fileno())),
-                              pass_fds=(listener.fileno(),), env={"NOTIFY_SOCKET": notify}):
-                hears("READY=1")
+                              pass_fds=(listener.fileno(),), env={"NOTIFY_SOCKET": notify, "WATCHDOG_USEC": "1000000"}):
+                for word in ("READY=1", "WATCHDOG=1"):
+                    hears(word)
                 Wire.__init__(waiting, self.root)
                 hears("STATUS=")
                 self.assertEqual(self.open()[1], ["httppost"])
