@@ -155,7 +155,7 @@ class Lab:
             shutil.rmtree(self.path, ignore_errors=True)
             raise
         self.url, self.certificate, self.public_key = line["url"], line["certificate"], line["publicKey"]
-        self.port = int(self.url.rsplit(":", 1)[1])
+        self.port, self.dashboard = int(self.url.rsplit(":", 1)[1]), ("127.0.0.1", line["dashboardPort"])
         self.tls = ssl.create_default_context(cafile=self.certificate)
         if not Lab._keys:
             Lab._keys = pathlib.Path(tempfile.mkdtemp(prefix="veltra-keys-"))

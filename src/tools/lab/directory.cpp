@@ -47,16 +47,20 @@ std::string replaced(std::string text, std::string_view what, const std::string&
 }
 
 // As deep as the parsers let it be.
-Value withURL(const Value& value, const std::string& url) {
-  if (const auto* text = value.asString()) return replaced(*text, "${url}", url);
+Value withAddresses(const Value& value, const std::string& url, int dashboardPort) {
+  if (const auto* text = value.asString()) {
+    if (*text == "${dashboardPort}") return dashboardPort;
+    return replaced(*text, "${url}", url);
+  }
   if (const auto* array = value.asArray()) {
     Array changed;
-    for (const auto& item : *array) changed.push_back(withURL(item, url));
+    for (const auto& item : *array) changed.push_back(withAddresses(item, url, dashboardPort));
     return changed;
   }
   if (const auto* dictionary = value.asDictionary()) {
     std::vector<Dictionary::Entry> changed;
-    for (const auto& [key, item] : *dictionary) changed.emplace_back(key, withURL(item, url));
+    for (const auto& [key, item] : *dictionary)
+      changed.emplace_back(key, withAddresses(item, url, dashboardPort));
     return Dictionary::fromEntries(std::move(changed));
   }
   return value;
@@ -117,8 +121,8 @@ Result<Directory, std::string> Directory::open(const std::string& path) {
   return directory;
 }
 
-Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& name,
-                                                          const std::string& url) const {
+Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& name, const std::string& url,
+                                                          int dashboardPort) const {
   using Kind = StorebagFailure::Kind;
   if (!isStorebagName(name))
     return Failure{StorebagFailure{Kind::notFound, "a storebag's name has letters, digits, - and _ only"}};
@@ -133,7 +137,7 @@ Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& nam
   if (!bytes) return Failure{StorebagFailure{Kind::unreadable, bytes.error().description}};
   const auto value = parsed(bytes.value(), json);
   if (!value) return Failure{StorebagFailure{Kind::unreadable, path + ": " + value.error()}};
-  const Value changed = withURL(value.value(), url);
+  const Value changed = withAddresses(value.value(), url, dashboardPort);
   if (!changed.asDictionary())
     return Failure{StorebagFailure{Kind::unreadable, path + ": a storebag is a dictionary at its top"}};
   return StorebagFile{*changed.asDictionary(), status.st_mtim.tv_sec};

@@ -38,8 +38,10 @@ class Directory {
   }
   const SigningKey& signingKey() const { return _signingKey; }
 
-  // NAME.plist, else NAME.json, read afresh; every "${url}" in its texts becomes `url`.
-  Result<StorebagFile, StorebagFailure> storebag(const std::string& name, const std::string& url) const;
+  // NAME.plist, else NAME.json, read afresh; every "${url}" in its texts becomes `url`, and a text that is
+  // "${dashboardPort}" the number.
+  Result<StorebagFile, StorebagFailure> storebag(const std::string& name, const std::string& url,
+                                                 int dashboardPort) const;
 
  private:
   Directory(std::string path, SigningKey signingKey)

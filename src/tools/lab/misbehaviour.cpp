@@ -32,16 +32,36 @@ Wrong readInteger(const Value& value, std::int64_t least, std::int64_t most, std
   return std::nullopt;
 }
 
-Wrong readSignature(const Value& value, Rule::Signature& into) {
-  const std::string* text = value.asString();
-  if (text && *text == "wrong")
-    into = Rule::Signature::wrong;
-  else if (text && *text == "missing")
-    into = Rule::Signature::missing;
-  else if (text && *text == "none")
-    into = Rule::Signature::none;
-  else
-    return R"("wrong", "missing" or "none")";
+template <typename T>
+struct Name {
+  std::string_view name;
+  T value;
+};
+constexpr Name<Rule::Signature> kSignatures[] = {{"wrong", Rule::Signature::wrong},
+                                                 {"missing", Rule::Signature::missing},
+                                                 {"none", Rule::Signature::none}};
+constexpr Name<Rule::Acknowledgement> kAcknowledgements[] = {
+    {"drop", Rule::Acknowledgement::dropped},      {"duplicate", Rule::Acknowledgement::duplicate},
+    {"reorder", Rule::Acknowledgement::reordered}, {"short", Rule::Acknowledgement::tooShort},
+    {"long", Rule::Acknowledgement::tooLong},      {"foreign", Rule::Acknowledgement::foreign},
+    {"stranger", Rule::Acknowledgement::stranger}};
+
+template <typename T, std::size_t count>
+Wrong readName(const Value& value, const Name<T> (&names)[count], T& into) {
+  std::string expected = "one of";
+  for (const auto& [name, meant] : names) {
+    if (value.asString() && *value.asString() == name) {
+      into = meant;
+      return std::nullopt;
+    }
+    expected.append(" \"").append(name).append("\"");
+  }
+  return expected;
+}
+
+Wrong readBody(const Value& value, std::string& into) {
+  if (!value.asData()) return readText(value, into) ? Wrong(R"(a text or {"$data": base64})") : std::nullopt;
+  into = value.asData()->bytes;
   return std::nullopt;
 }
 
@@ -62,12 +82,16 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   if (key == "stall") return readBoolean(value, rule.stall);
   if (key == "endless") return readBoolean(value, rule.endless);
   if (key == "lastModified") return readBoolean(value, rule.lastModified);
-  if (key == "sign") return readSignature(value, rule.sign);
+  if (key == "sign") return readName(value, kSignatures, rule.sign);
+  if (key == "ack") return readName(value, kAcknowledgements, rule.acknowledgement);
   if (key == "headers") return readHeaders(value, rule.headers);
-  if (key == "body") return readText(value, rule.body.emplace());
+  if (key == "body") return readBody(value, rule.body.emplace());
   if (key == "times") {
     wrong = readInteger(value, 1, 1'000'000'000, number);
     rule.times = number;
+  } else if (key == "share") {
+    wrong = readInteger(value, 0, 100, number);
+    rule.share = number;
   } else if (key == "status") {
     wrong = readInteger(value, 200, 599, number);
     rule.status = static_cast<int>(number);
@@ -78,8 +102,8 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
     wrong = readInteger(value, 0, 3'600'000, number);
     rule.drip = std::chrono::milliseconds(number);
   } else {
-    return "one of path, times, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
-           "lastModified, headers, body";
+    return "one of path, times, share, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
+           "ack, lastModified, headers, body";
   }
   return wrong;
 }
@@ -115,6 +139,7 @@ std::optional<Rule> Misbehaviour::take(std::string_view path) {
       best = rule;
   }
   if (best == _rules.end()) return std::nullopt;
+  if (best->share && static_cast<std::int64_t>(_draw() % 100) >= *best->share) return std::nullopt;
   Rule taken = *best;
   taken.generation = _generation;
   if (best->times && --*best->times == 0) _rules.erase(best);

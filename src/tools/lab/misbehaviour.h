@@ -4,6 +4,7 @@
 #include <chrono>
 #include <cstdint>
 #include <optional>
+#include <random>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -17,8 +18,19 @@ namespace veltrad::lab {
 // One rule. What is not said is left as it would have been.
 struct Rule {
   enum class Signature { right, wrong, missing, none };
+  enum class Acknowledgement {
+    right,
+    dropped,
+    duplicate,
+    reordered,  // goes out behind the next one, or after a second
+    tooShort,   // 61 bytes
+    tooLong,    // 2000 bytes
+    foreign,    // for another event number
+    stranger,   // from another port
+  };
   std::string path;                   // matches requests whose path starts with it; empty: all
   std::optional<std::int64_t> times;  // how many requests it is for; absent: until the reset
+  std::optional<std::int64_t> share;  // of its requests it is for so many in a hundred, drawn at random
   std::optional<int> status;
   std::chrono::milliseconds delay{0};
   std::optional<std::chrono::milliseconds> drip;  // the body goes out a byte at a time, this far apart
@@ -29,9 +41,10 @@ struct Rule {
   // wrong: one bit of it is turned; missing: the container has no "signature"; none: the bare storebag, no
   // container
   Signature sign = Signature::right;
-  bool lastModified = true;  // false: no "Last-Modified" header
-  std::optional<std::string> body;
-  Dictionary headers;            // texts; they replace headers of the same name
+  Acknowledgement acknowledgement = Acknowledgement::right;  // of a datagram
+  bool lastModified = true;                                  // false: no "Last-Modified" header
+  std::optional<std::string> body;                           // bytes
+  Dictionary headers;                                        // texts; they replace headers of the same name
   std::uint64_t generation = 0;  // set by take(): the rules' generation at that time
 };
 
@@ -42,7 +55,8 @@ class Misbehaviour {
  public:
   // A rule for the same path replaces the earlier one.
   void add(Rule rule);
-  // The rule with the longest path that matches, counted down by one.
+  // The rule with the longest path that matches, counted down by one; nothing where its share leaves this
+  // request out.
   std::optional<Rule> take(std::string_view path);
   // Forgets every rule and lets go whoever waits in hold().
   void reset();
@@ -59,6 +73,7 @@ class Misbehaviour {
   mutable Mutex _mutex{LockRank::leaf};
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);
+  std::minstd_rand _draw GUARDED_BY(_mutex);  // never seeded: every run draws alike
   std::uint64_t _generation GUARDED_BY(_mutex) = 0;
   bool _stopped GUARDED_BY(_mutex) = false;
 };

@@ -1,14 +1,14 @@
 // The lab's live page. Any thread.
 #include "page.h"
 
+#include "arrivals.h"
 #include "base/text.h"
-#include "received.h"
 
 namespace veltrad::lab {
 namespace {
 
 std::string listed(const char* title, const Received& received) {
-  std::string html = std::string("<h2>") + title + "</h2>\n";
+  std::string html = std::string("<h2>") + title + ", the newest first</h2>\n";
   const auto lines = received.newest();
   if (lines.empty()) html += "<p>nothing yet</p>\n";
   for (const auto& line : lines) html += "<pre>" + escapedForHTML(line) + "</pre>\n";
@@ -34,14 +34,16 @@ std::string escapedForHTML(const std::string& text) {
   return escaped;
 }
 
-std::string livePage(const std::string& url, const Received& events, const Received& storebags) {
-  return "<!DOCTYPE html>\n<html lang=\"en\"><head><meta charset=\"utf-8\"><meta http-equiv=\"refresh\" "
-         "content=\"2\">"
-         "<title>veltra-lab</title>\n<style>body{font:14px sans-serif;margin:2em}"
-         "pre{white-space:pre-wrap;overflow-wrap:anywhere;background:#f2f2f2;padding:.5em}</style></"
-         "head>\n<body><h1>" +
-         escapedForHTML(url) + "</h1>\n" + listed("Events, the newest first", events) +
-         listed("Storebag requests, the newest first", storebags) + "</body></html>\n";
+std::string livePage(const std::vector<std::string>& addresses, Arrivals& arrivals) {
+  std::string html =
+      "<!DOCTYPE html>\n<html lang=\"en\"><head><meta charset=\"utf-8\"><meta http-equiv=\"refresh\" "
+      "content=\"2\"><title>veltra-lab</title>\n<style>body{font:14px sans-serif;margin:2em}"
+      "pre{white-space:pre-wrap;overflow-wrap:anywhere;background:#f2f2f2;padding:.5em}</style></head>\n"
+      "<body><h1>veltra-lab</h1>\n<ul>\n";
+  for (const auto& address : addresses) html += "<li>" + escapedForHTML(address) + "</li>\n";
+  html += "</ul>\n";
+  for (const auto& kind : arrivals.kinds()) html += listed(kind.title, kind.lines);
+  return html + "</body></html>\n";
 }
 
 }  // namespace veltrad::lab

@@ -2,13 +2,15 @@
 #pragma once
 
 #include <string>
+#include <vector>
 
 namespace veltrad::lab {
 
-class Received;
+struct Arrivals;
 
-// A plain page that loads itself anew every two seconds and lists the newest arrivals.
-std::string livePage(const std::string& url, const Received& events, const Received& storebags);
+// A plain page that loads itself anew every two seconds: the addresses of the servers, one a line, and the
+// newest arrivals.
+std::string livePage(const std::vector<std::string>& addresses, Arrivals& arrivals);
 // Text between tags: what comes from clients is never markup.
 std::string escapedForHTML(const std::string& text);
 

@@ -1,5 +1,5 @@
-// The lab's HTTPS server: storebags, the event collector, control and the live page. The only file that
-// includes the HTTP library; its threads run the handlers.
+// The lab's HTTPS server: storebags, the event collector, log data, uploads, control and the live page. The
+// only file that includes the HTTP library; its threads run the handlers.
 #include "server.h"
 
 #include <httplib.h>
@@ -7,14 +7,19 @@
 #include <charconv>
 #include <thread>
 
+#include "base/json.h"
+#include "base/property_list.h"
 #include "base/text.h"
 #include "connections.h"
 #include "page.h"
+#include "upload_digest.h"
 
 namespace veltrad::lab {
 namespace {
 
 constexpr std::size_t kMostBodyBytes = 64u << 20;
+constexpr std::size_t kMostUploadBytes = 2u << 30;
+constexpr PropertyListLimits kLogDataLimits{kMostBodyBytes, 64, 500'000, kMostBodyBytes};
 constexpr std::size_t kThreads = 64;  // each open connection holds one
 constexpr std::size_t kPieceBytes = 64u << 10;
 constexpr std::chrono::milliseconds kLongestWait{60'000};
@@ -73,6 +78,22 @@ void sendAndEnd(httplib::Response& response, const std::string& body, std::size_
       });
 }
 
+void refuseAndEnd(httplib::Response& response, int status, const std::string& why) {
+  response.status = status;
+  sendAndEnd(response, why, why.size(), kPlainText);
+}
+
+bool isBelow(std::string_view path, std::string_view top) {
+  return path.starts_with(top) && (path.size() == top.size() || path[top.size()] == '/');
+}
+
+// The decoded texts by their names.
+Dictionary queryOf(const httplib::Request& request) {
+  Dictionary query;
+  for (const auto& [name, text] : request.params) query.set(toUTF8(name), toUTF8(text));
+  return query;
+}
+
 }  // namespace
 
 struct Server::Library {
@@ -82,8 +103,12 @@ struct Server::Library {
   bool useCertificate(SSL_CTX& context);
   void route();
   void storebag(const httplib::Request& request, httplib::Response& response);
-  void collect(const httplib::Request& request, httplib::Response& response,
-               const httplib::ContentReader& reader);
+  void post(const httplib::Request& request, httplib::Response& response,
+            const httplib::ContentReader& reader);
+  void collect(const httplib::Request& request, httplib::Response& response, const std::string& body);
+  void logData(const httplib::Request& request, httplib::Response& response, const std::string& body);
+  void upload(const httplib::Request& request, httplib::Response& response,
+              const httplib::ContentReader& reader);
   void control(const httplib::Request& request, httplib::Response& response, const std::string& body);
   void received(const httplib::Request& request, httplib::Response& response);
   void send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
@@ -96,6 +121,7 @@ struct Server::Library {
   httplib::SSLServer http;
   std::thread accepting;
   std::atomic<bool> failed{false};
+  std::atomic<unsigned> storedLogData{0};
 };
 
 bool Server::Library::useCertificate(SSL_CTX& context) {
@@ -113,7 +139,7 @@ void Server::Library::route() {
   http.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
   http.set_keep_alive_max_count(1'000'000'000);
   http.set_keep_alive_timeout(60);
-  http.set_payload_max_length(kMostBodyBytes);
+  http.set_payload_max_length(kMostUploadBytes);  // smaller bounds are the handlers'
   http.set_tcp_nodelay(true);
   // The library's own choice would let a second lab share the port.
   http.set_socket_options([](socket_t socket) {
@@ -124,12 +150,15 @@ void Server::Library::route() {
     refuse(response, 500, "the lab could not handle this request");
   });
   http.Get("/", [this](const Request&, Response& response) {
-    response.set_content(livePage(lab._url, lab._events, lab._storebags), "text/html; charset=utf-8");
+    response.set_content(livePage({lab._url, "Log data: " + lab.logDataURL(), "Uploads: " + lab.uploadURL(),
+                                   "Dashboard: 127.0.0.1, UDP port " + std::to_string(lab.dashboardPort())},
+                                  lab._arrivals),
+                         "text/html; charset=utf-8");
   });
   http.Get("/received", [this](const Request& request, Response& response) { received(request, response); });
   http.Get("/.+", [this](const Request& request, Response& response) { storebag(request, response); });
   const auto collector = [this](const Request& request, Response& response,
-                                const httplib::ContentReader& reader) { collect(request, response, reader); };
+                                const httplib::ContentReader& reader) { post(request, response, reader); };
   http.Post("/.*", collector);
   http.Put("/.*", collector);
   http.Delete("/control", [this](const Request&, Response& response) {
@@ -141,7 +170,7 @@ void Server::Library::route() {
 void Server::Library::storebag(const httplib::Request& request, httplib::Response& response) {
   const std::string name = request.path.substr(request.path.rfind('/') + 1);
   const auto rule = lab._misbehaviour.take(request.path);
-  const auto file = lab._directory.storebag(name, lab._url);
+  const auto file = lab._directory.storebag(name, lab._url, lab.dashboardPort());
   Answer answer = file ? answerWithStorebag(file.value(), lab._directory.signingKey(),
                                             rule ? rule->sign : Rule::Signature::right, lab._maxAge,
                                             request.get_header_value("If-Modified-Since"))
@@ -150,12 +179,13 @@ void Server::Library::storebag(const httplib::Request& request, httplib::Respons
   Dictionary line = arrival(request);
   line.set("name", toUTF8(name));
   line.set("outcome", outcome(rule, answer));
-  lab._storebags.add(line, {});
+  lab._arrivals.storebags.add(line, {});
   send(request, response, answer, rule);
 }
 
-void Server::Library::collect(const httplib::Request& request, httplib::Response& response,
-                              const httplib::ContentReader& reader) {
+void Server::Library::post(const httplib::Request& request, httplib::Response& response,
+                           const httplib::ContentReader& reader) {
+  if (isBelow(request.path, kUploadPath)) return upload(request, response, reader);
   std::string body;  // the library has undone the gzip
   const bool whole = reader([&body](const char* bytes, std::size_t length) {
     if (body.size() + length > kMostBodyBytes) return false;
@@ -165,12 +195,16 @@ void Server::Library::collect(const httplib::Request& request, httplib::Response
   if (!whole) {
     // What is left of it would be read as the next request.
     const bool tooLarge = response.status == 413 || body.size() + kPieceBytes > kMostBodyBytes;
-    const std::string why =
-        tooLarge ? "a body has at most 64 MiB\n" : "the body is cut short or is no gzip\n";
-    response.status = tooLarge ? 413 : 400;
-    return sendAndEnd(response, why, why.size(), kPlainText);
+    return refuseAndEnd(response, tooLarge ? 413 : 400,
+                        tooLarge ? "a body has at most 64 MiB\n" : "the body is cut short or is no gzip\n");
   }
   if (request.path == "/control") return control(request, response, body);
+  if (isBelow(request.path, kLogDataPath)) return logData(request, response, body);
+  collect(request, response, body);
+}
+
+void Server::Library::collect(const httplib::Request& request, httplib::Response& response,
+                              const std::string& body) {
   const auto rule = lab._misbehaviour.take(request.path);
   Answer answer;
   answer.body = "{}";
@@ -181,7 +215,51 @@ void Server::Library::collect(const httplib::Request& request, httplib::Response
   line.set("bytes", length.empty() ? std::uint64_t{body.size()}
                                    : std::uint64_t{std::strtoull(length.c_str(), nullptr, 10)});
   line.set("outcome", outcome(rule, answer));
-  lab._events.add(line, bodyAsJSON(body));
+  lab._arrivals.events.add(line, bodyAsJSON(body));
+  send(request, response, answer, rule);
+}
+
+// Answers with the place where the array is said to be stored.
+void Server::Library::logData(const httplib::Request& request, httplib::Response& response,
+                              const std::string& body) {
+  const auto rule = lab._misbehaviour.take(request.path);
+  Answer answer;
+  answer.type = kPlainText;
+  answer.body = "/logs/" + std::to_string(++storedLogData);
+  if (rule) applyRule(*rule, answer);
+  Dictionary line = arrival(request);
+  line.set("bytes", std::uint64_t{body.size()});
+  line.set("answer", toUTF8(answer.body));
+  line.set("outcome", outcome(rule, answer));
+  const auto archive = parsePropertyList(body, kLogDataLimits);
+  if (!archive) line.set("problem", archive.error().detail);
+  lab._arrivals.logData.add(line, archive ? writeJSON(archive.value()) : bodyAsJSON(body));
+  send(request, response, answer, rule);
+}
+
+void Server::Library::upload(const httplib::Request& request, httplib::Response& response,
+                             const httplib::ContentReader& reader) {
+  Dictionary line = arrival(request);
+  // Else the library would undo the gzip; the request is its own object and not constant there.
+  const_cast<httplib::Request&>(request).headers.erase("Content-Encoding");
+  UploadDigest digest;
+  const bool whole = reader([&digest](const char* bytes, std::size_t length) {
+    digest.add({bytes, length});
+    return true;
+  });
+  if (!whole) {
+    const bool tooLarge = response.status == 413;
+    return refuseAndEnd(response, tooLarge ? 413 : 400,
+                        tooLarge ? "an upload has at most 2 GiB\n" : "the upload is cut short\n");
+  }
+  const auto rule = lab._misbehaviour.take(request.path);
+  Answer answer;
+  answer.body = "{\"success\": true}";
+  if (rule) applyRule(*rule, answer);
+  line.set("query", queryOf(request));
+  line.set("outcome", outcome(rule, answer));
+  line.merge(digest.finish());
+  lab._arrivals.uploads.add(line, {});
   send(request, response, answer, rule);
 }
 
@@ -192,12 +270,15 @@ void Server::Library::control(const httplib::Request&, httplib::Response& respon
   response.set_content("{}", "application/json");
 }
 
-// ?kind=events|storebags, and with &count=N&waitMs=M only once N lines have come or M milliseconds are over.
+// ?kind=events, and with &count=N&waitMs=M only once N lines have come or M milliseconds are over.
 void Server::Library::received(const httplib::Request& request, httplib::Response& response) {
   const std::string kind = request.get_param_value("kind");
-  if (kind != "events" && kind != "storebags")
-    return refuse(response, 400, "kind: expected events or storebags");
-  Received& lines = kind == "events" ? lab._events : lab._storebags;
+  const auto kinds = lab._arrivals.kinds();
+  const auto found =
+      std::find_if(kinds.begin(), kinds.end(), [&](const auto& one) { return one.name == kind; });
+  if (found == kinds.end())
+    return refuse(response, 400, "kind: expected events, storebags, dashboard, logdata or uploads");
+  Received& lines = found->lines;
   const auto wait = std::min<std::uint64_t>(numberOf(request, "waitMs"), kLongestWait.count());
   lines.waitFor(numberOf(request, "count"), std::chrono::milliseconds(wait));
   const std::uint64_t first = lines.firstByte();
@@ -247,16 +328,17 @@ void Server::Library::sendDripping(httplib::Response& response, const Rule& rule
 Server::Server(const Directory& directory, int maxAge)
     : _directory(directory),
       _maxAge(maxAge),
-      _events(directory.receivedPath("events")),
-      _storebags(directory.receivedPath("storebags")) {}
+      _arrivals(directory),
+      _dashboard(_misbehaviour, _arrivals.dashboard) {}
 
 Server::~Server() {
   stop();
 }
 
-std::optional<std::string> Server::start(int port) {
-  for (const Received* lines : {&_events, &_storebags}) {
-    if (!lines->ok()) return lines->path() + ": cannot be opened for appending: " + std::strerror(errno);
+std::optional<std::string> Server::start(int port, int dashboardPort) {
+  for (const auto& kind : _arrivals.kinds()) {
+    if (!kind.lines.ok())
+      return kind.lines.path() + ": cannot be opened for appending: " + std::strerror(errno);
   }
   _library = std::make_unique<Library>(*this);
   auto& http = _library->http;
@@ -272,14 +354,14 @@ std::optional<std::string> Server::start(int port) {
   _library->accepting = std::thread([this] { _library->failed = !_library->http.listen_after_bind(); });
   while (!http.is_running() && !_library->failed) std::this_thread::sleep_for(std::chrono::milliseconds(1));
   if (_library->failed) return "the server could not accept connections";
-  return std::nullopt;
+  return _dashboard.start(dashboardPort);
 }
 
 void Server::stop() {
   if (!_library || !_library->accepting.joinable()) return;
   _misbehaviour.stop();
-  _events.stop();
-  _storebags.stop();
+  _dashboard.stop();
+  for (const auto& kind : _arrivals.kinds()) kind.lines.stop();
   _library->connections.stop();
   _library->http.stop();
   _library->accepting.join();
