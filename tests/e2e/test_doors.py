@@ -74,6 +74,7 @@ class Doors(SystemTest):
 
     def test_second_daemon_stale_and_foreign_files(self):
         with self.serving():
+            self.assertEqual(os.stat(self.root.socket).st_mode & 0o777, 0o666)
             self.refused(self.root, str(self.root.path / "run/veltrad"))
             self.assertEqual(self.open()[1], ["httppost"])
         killed = self.daemon()

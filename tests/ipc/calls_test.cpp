@@ -64,8 +64,6 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
       {call(kSend, {{"category", 5}}), "argument \"type\" must be a number"},
       {call("sendMessageWithDictionary:reply:", {{"message", 1}}),
        "argument \"message\" must be a dictionary"},
-      {call(kUploadFile, {}), "argument \"path\" must be a text"},
-      {call(kUploadLogData, {{"data", "x"}}), "argument \"data\" must be an array"},
       {call(kOneShot, {{"type", 1}}), "argument \"category\" must be a number"},
       {callFrame(9, kSend, {}, FrameKind::largeCall),
        "a large call is for \"uploadLogData:completionHandler:\" alone"},

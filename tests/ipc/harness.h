@@ -26,7 +26,6 @@ inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds ti
 class RecordingSession final : public ClientSessionInterface {
  public:
   using OnMessage = std::function<void(std::uint16_t category, StringReply)>;
-  // `onMessage`, when given, answers messages in place of "done".
   RecordingSession(Journal& journal, OnMessage onMessage)
       : _journal(journal), _onMessage(std::move(onMessage)) {}
 
