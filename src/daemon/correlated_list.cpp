@@ -1,46 +1,79 @@
 // Looking up sessions by their level.
 #include "daemon/correlated_list.h"
 
-#include <algorithm>
-#include <map>
+#include <utility>
 
 namespace veltrad {
 
-std::shared_ptr<VeltradSession> getFirstSessionWithHierarchy(std::int32_t hierarchy,
-                                                             const CorrelatedList& inSessionList) {
-  const auto at = std::find_if(inSessionList.begin(), inSessionList.end(), [hierarchy](const auto& session) {
-    return session->getSessionHierarchy() == hierarchy;
-  });
-  return at == inSessionList.end() ? nullptr : *at;
+void CorrelatedList::join(const SessionPointer& session) {
+  const Place place{session->getSessionHierarchy(), _nextJoined};
+  if (!_places.emplace(session.get(), place).second) return;
+  ++_nextJoined;
+  _levels[place.level].emplace(place.joined, session);
 }
 
-bool contains(const CorrelatedList& list, const VeltradSession& session) {
-  return std::any_of(list.begin(), list.end(), [&](const auto& listed) { return listed.get() == &session; });
+void CorrelatedList::leave(const VeltradSession& session) {
+  const auto at = _places.find(&session);
+  if (at == _places.end()) return;
+  const SessionPointer kept = take(at->second);  // may be the last reference
+  _places.erase(at);
 }
 
-std::shared_ptr<VeltradSession> topmostAggregator(std::int32_t hierarchy, const CorrelatedList& list) {
-  std::map<std::int32_t, std::shared_ptr<VeltradSession>> firstOfLevel;
-  for (const auto& session : list) {
-    const std::int32_t level = session->getSessionHierarchy();
-    if (level >= 0 && level < hierarchy) firstOfLevel.emplace(level, session);
-  }
-  for (const auto& [level, session] : firstOfLevel) {
-    if (session->hasAggregator()) return session;
+void CorrelatedList::refreshLevel(const VeltradSession& session) {
+  const auto at = _places.find(&session);
+  const std::int32_t level = session.getSessionHierarchy();
+  if (at == _places.end() || at->second.level == level) return;
+  SessionPointer moved = take(at->second);
+  at->second.level = level;
+  _levels[level].emplace(at->second.joined, std::move(moved));
+}
+
+CorrelatedList::SessionPointer CorrelatedList::take(const Place& place) {
+  const auto level = _levels.find(place.level);
+  SessionPointer taken = std::move(level->second.extract(place.joined).mapped());
+  if (level->second.empty()) _levels.erase(level);
+  return taken;
+}
+
+CorrelatedList::SessionPointer CorrelatedList::getFirstSessionWithHierarchy(std::int32_t hierarchy) const {
+  const auto level = _levels.find(hierarchy);
+  return level == _levels.end() ? nullptr : level->second.begin()->second;
+}
+
+CorrelatedList::SessionPointer CorrelatedList::topmostAggregator(std::int32_t hierarchy) const {
+  for (auto level = _levels.lower_bound(0); level != _levels.end() && level->first < hierarchy; ++level) {
+    const SessionPointer& first = level->second.begin()->second;
+    if (first->hasAggregator()) return first;
   }
   return nullptr;
 }
 
-AncestorIDs ancestorIDs(std::int32_t hierarchy, const CorrelatedList& list) {
+AncestorIDs CorrelatedList::ancestorIDs(std::int32_t hierarchy) const {
+  std::vector<const std::string*> upwards;
+  std::int32_t level = hierarchy - 1;
+  for (; level >= 0; --level) {
+    const auto found = _levels.find(level);
+    if (found == _levels.end()) break;
+    upwards.push_back(&found->second.begin()->second->sessionIDString());
+  }
   AncestorIDs ids;
-  for (std::int32_t level = hierarchy - 1; level >= 0; --level) {
-    const auto ancestor = getFirstSessionWithHierarchy(level, list);
-    if (!ancestor) {
-      ids.complete = false;
-      return ids;
-    }
-    ids.text = ids.text.empty() ? ancestor->sessionIDString() : ancestor->sessionIDString() + "." + ids.text;
+  ids.complete = level < 0;
+  for (auto id = upwards.rbegin(); id != upwards.rend(); ++id) {
+    if (!ids.text.empty()) ids.text += '.';
+    ids.text += **id;
   }
   return ids;
+}
+
+std::vector<CorrelatedList::SessionPointer> CorrelatedList::below(std::int32_t hierarchy) const {
+  std::map<std::uint64_t, SessionPointer> found;
+  for (auto level = _levels.upper_bound(hierarchy); level != _levels.end(); ++level) {
+    found.insert(level->second.begin(), level->second.end());
+  }
+  std::vector<SessionPointer> sessions;
+  sessions.reserve(found.size());
+  for (auto& [joined, session] : found) sessions.push_back(std::move(session));
+  return sessions;
 }
 
 }  // namespace veltrad

@@ -6,9 +6,30 @@
 
 namespace veltrad {
 
-const CorrelatedList* VeltradAgent::correlatedList(const VeltradSession& session) const {
-  const auto at = _correlatedSessions.find(userInfoKeyForUserInfo(session.userInfo().get()));
-  return at == _correlatedSessions.end() ? nullptr : &at->second;
+const CorrelatedList* VeltradAgent::correlatedList(const VeltradSession& session) {
+  SharedDictionary userInfo = session.userInfo();
+  const auto membership = _memberships.find(&session);
+  const bool member = membership != _memberships.end();
+  if (member && userInfo && membership->second.userInfo == userInfo) return membership->second.list;
+  const std::string key = userInfoKeyForUserInfo(userInfo.get());
+  if (member && membership->second.key == key) membership->second.userInfo = std::move(userInfo);
+  const auto list = _correlatedSessions.find(key);
+  return list == _correlatedSessions.end() ? nullptr : &list->second;
+}
+
+const CorrelatedList* VeltradAgent::listHolding(const VeltradSession& session, const std::string& key,
+                                                const char* operation) {
+  const CorrelatedList* list = correlatedList(session);
+  if (!list || list->empty()) {
+    logError("%s: ERROR: No sessions found for user info key %s", operation, key.c_str());
+    return nullptr;
+  }
+  if (!list->contains(session)) {
+    logError("%s: ERROR: Session %u not found for user info key %s", operation, session.sessionID(),
+             key.c_str());
+    return nullptr;
+  }
+  return list;
 }
 
 std::optional<std::string> VeltradAgent::parentSessionIDStringForSession(const VeltradSession& session) {
@@ -18,18 +39,9 @@ std::optional<std::string> VeltradAgent::parentSessionIDStringForSession(const V
   logDebug("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", key.c_str(),
            session.sessionID());
   const Lock held(_lock);
-  const CorrelatedList* list = correlatedList(session);
-  if (!list || list->empty()) {
-    logError("parentSessionIDStringForSession: ERROR: No sessions found for user info key %s", key.c_str());
-    return std::nullopt;
-  }
-  if (!contains(*list, session)) {
-    logError("parentSessionIDStringForSession: ERROR: Session %u not found for user info key %s",
-             session.sessionID(), key.c_str());
-    return std::nullopt;
-  }
-  if (hierarchy < 0) return std::nullopt;
-  AncestorIDs ids = ancestorIDs(hierarchy, *list);
+  const CorrelatedList* list = listHolding(session, key, "parentSessionIDStringForSession");
+  if (!list || hierarchy < 0) return std::nullopt;
+  AncestorIDs ids = list->ancestorIDs(hierarchy);
   if (!ids.complete) {
     logInfo(
         "parentSessionIDStringForSession: Found a gap in hierarchy (one of parents missing): incomplete "
@@ -47,17 +59,9 @@ std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const Veltra
   logDebug("parentSessionForChild: Checking userInfoKey '%s' for session %u", key.c_str(),
            session.sessionID());
   const Lock held(_lock);
-  const CorrelatedList* list = correlatedList(session);
-  if (!list || list->empty()) {
-    logError("parentSessionForChild: ERROR: No sessions found for user info key %s", key.c_str());
-    return nullptr;
-  }
-  if (!contains(*list, session)) {
-    logError("parentSessionForChild: ERROR: Session %u not found for user info key %s", session.sessionID(),
-             key.c_str());
-    return nullptr;
-  }
-  auto parent = getFirstSessionWithHierarchy(hierarchy - 1, *list);
+  const CorrelatedList* list = listHolding(session, key, "parentSessionForChild");
+  if (!list) return nullptr;
+  auto parent = list->getFirstSessionWithHierarchy(hierarchy - 1);
   if (!parent) {
     logInfo("parentSessionForChild: Unable to find session with hierarchy of %d for userInfoKey '%s'",
             hierarchy - 1, key.c_str());
@@ -66,15 +70,14 @@ std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const Veltra
 }
 
 std::shared_ptr<VeltradSession> VeltradAgent::getAncestorWithAggregatorForSession(
-    const VeltradSession& session) const {
+    const VeltradSession& session) {
   if (!session.userInfo()) {
     logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", session.sessionID());
     return nullptr;
   }
   const std::int32_t hierarchy = session.getSessionHierarchy();
   const CorrelatedList* list = hierarchy < 1 ? nullptr : correlatedList(session);
-  if (!list) return nullptr;
-  return topmostAggregator(hierarchy, *list);
+  return list ? list->topmostAggregator(hierarchy) : nullptr;
 }
 
 bool VeltradAgent::withAncestorAggregator(const VeltradSession& session,
@@ -86,28 +89,42 @@ bool VeltradAgent::withAncestorAggregator(const VeltradSession& session,
 }
 
 void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) {
-  if (!session->userInfo()) {
-    logInfo("updateDownstreamSessions: No user info found for session %u", session->sessionID());
-    return;
+  std::vector<std::string> lines;
+  {
+    const Lock held(_lock);
+    lines = updateDownstreamSessionsLocked(*session);
   }
-  const std::int32_t hierarchy = session->getSessionHierarchy();
-  const Lock held(_lock);
-  session->updateCombinedSessionID();
-  session->syncReportingStates();
-  const bool ancestorAggregates = hierarchy >= 1 && getAncestorWithAggregatorForSession(*session) != nullptr;
-  if (ancestorAggregates) session->shutdownSessionAggregation();
-  const CorrelatedList* list = correlatedList(*session);
-  if (!list) return;
-  for (const auto& below : *list) {
-    if (below->getSessionHierarchy() <= hierarchy) continue;
+  for (const std::string& line : lines) logError("%s", line.c_str());
+}
+
+std::vector<std::string> VeltradAgent::updateDownstreamSessionsLocked(VeltradSession& session) {
+  std::vector<std::string> lines;
+  const auto shutDown = [&lines](VeltradSession& ending) {
+    if (auto line = ending.shutdownSessionAggregation()) lines.push_back(std::move(*line));
+  };
+  const auto membership = _memberships.find(&session);
+  if (membership != _memberships.end()) membership->second.list->refreshLevel(session);
+  if (!session.userInfo()) {
+    logInfo("updateDownstreamSessions: No user info found for session %u", session.sessionID());
+    return lines;
+  }
+  const std::int32_t hierarchy = session.getSessionHierarchy();
+  session.updateCombinedSessionID();
+  session.syncReportingStates();
+  const bool ancestorAggregates = hierarchy >= 1 && getAncestorWithAggregatorForSession(session) != nullptr;
+  if (ancestorAggregates) shutDown(session);
+  const CorrelatedList* list = correlatedList(session);
+  if (!list) return lines;
+  for (const auto& below : list->below(hierarchy)) {
     logDebug(
         "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session %u",
         below->sessionID());
     below->updateCombinedSessionID();
     below->syncReportingStates();
-    const bool above = session->hasAggregator() || ancestorAggregates;
-    if (above && below->hasAggregator()) below->shutdownSessionAggregation();
+    const bool above = session.hasAggregator() || ancestorAggregates;
+    if (above && below->hasAggregator()) shutDown(*below);
   }
+  return lines;
 }
 
 }  // namespace veltrad

@@ -13,6 +13,13 @@
 
 namespace veltrad {
 
+namespace {
+// Of lists that nobody is in any more: so many identities, and no long names, or clients that invent them
+// grow the daemon without end.
+constexpr std::size_t kMostKeys = 4096;
+constexpr std::size_t kLongestIdleKey = 256;  // bytes
+}  // namespace
+
 VeltradAgent::VeltradAgent(const SessionServices& services, StorebagSource& source,
                            platform::Transaction& transaction)
     : _services(services), _transaction(transaction), _cachedStorebags(source, services.clock) {}
@@ -60,15 +67,21 @@ void VeltradAgent::sessionInvalidated(const std::shared_ptr<VeltradSession>& ses
     if (_sessionList.empty()) _transaction.close();
   }
   const Lock held(_lock);
-  leaveCorrelatedList(session);
+  leaveCorrelatedList(*session);
 }
 
 // By the remembered key: the session's user info may have been taken away since it joined.
-void VeltradAgent::leaveCorrelatedList(const std::shared_ptr<VeltradSession>& session) {
-  const auto key = _keyOfSession.find(session.get());
-  if (key == _keyOfSession.end()) return;
-  std::erase(_correlatedSessions[key->second], session);
-  _keyOfSession.erase(key);
+void VeltradAgent::leaveCorrelatedList(const VeltradSession& session) {
+  const auto membership = _memberships.find(&session);
+  if (membership == _memberships.end()) return;
+  const std::string key = std::move(membership->second.key);
+  CorrelatedList& list = *membership->second.list;
+  _memberships.erase(membership);
+  list.leave(session);
+  if (list.empty() && (key.size() > kLongestIdleKey || _correlatedSessions.size() > kMostKeys)) {
+    _correlatedSessions.erase(key);
+  }
+  _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
 std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const VeltradSession& session) {
@@ -92,11 +105,12 @@ void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSessio
   }
   const std::string key = userInfoKeyForUserInfo(userInfo.get());
   const Lock held(_lock);
-  leaveCorrelatedList(session);
+  leaveCorrelatedList(*session);
   logDebug("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s", session->sessionID(),
            key.c_str());
-  _correlatedSessions[key].push_back(session);
-  _keyOfSession[session.get()] = key;
+  CorrelatedList& list = _correlatedSessions[key];
+  list.join(session);
+  _memberships[session.get()] = {key, &list, userInfo};
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 

@@ -6,6 +6,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 #include "base/mutex.h"
@@ -46,11 +47,16 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
  private:
   void addSession(std::shared_ptr<VeltradSession> session);
   void sessionInvalidated(const std::shared_ptr<VeltradSession>& session);
-  void leaveCorrelatedList(const std::shared_ptr<VeltradSession>& session) REQUIRES(_lock);
-  // The sessions that share the session's key, in the order of joining; null where the key has no list.
-  const CorrelatedList* correlatedList(const VeltradSession& session) const REQUIRES(_lock);
-  std::shared_ptr<VeltradSession> getAncestorWithAggregatorForSession(const VeltradSession& session) const
+  void leaveCorrelatedList(const VeltradSession& session) REQUIRES(_lock);
+  // The sessions that share the session's key; null where the key has no list.
+  const CorrelatedList* correlatedList(const VeltradSession& session) REQUIRES(_lock);
+  // The same; null, with a log line, also where the session is not in it.
+  const CorrelatedList* listHolding(const VeltradSession& session, const std::string& key,
+                                    const char* operation) REQUIRES(_lock);
+  std::shared_ptr<VeltradSession> getAncestorWithAggregatorForSession(const VeltradSession& session)
       REQUIRES(_lock);
+  // The lines that are to be logged once the lock is released.
+  std::vector<std::string> updateDownstreamSessionsLocked(VeltradSession& session) REQUIRES(_lock);
 
   // Constant after construction.
   const SessionServices _services;
@@ -62,9 +68,16 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
 
   RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
   StorebagCache _cachedStorebags GUARDED_BY(_lock);
-  // Lists stay when they become empty. A session is in at most one: that of the key it is remembered under.
+  // Empty lists stay, within a bound.
   std::map<std::string, CorrelatedList> _correlatedSessions GUARDED_BY(_lock);
-  std::map<const VeltradSession*, std::string> _keyOfSession GUARDED_BY(_lock);
+  // The one list that a session is in. `userInfo` is the dictionary whose key was last seen to be this one,
+  // so that a message does not form the key again.
+  struct Membership {
+    std::string key;
+    CorrelatedList* list;
+    SharedDictionary userInfo;
+  };
+  std::unordered_map<const VeltradSession*, Membership> _memberships GUARDED_BY(_lock);
 
   // Kept beside the collections.
   std::atomic<std::size_t> _sessionCount{0};

@@ -12,12 +12,6 @@
 
 namespace veltrad {
 
-namespace {
-void logProxyFailure(const std::optional<std::string>& failure) {
-  if (failure) logError("sendMessageWithDictionary: Failed to get remote object proxy: %s", failure->c_str());
-}
-}  // namespace
-
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                              OptionalDictionary payload, StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
@@ -105,17 +99,17 @@ void VeltradSession::aggregateMessage(const SharedDictionary& info, double times
     merged = *payload;
     if (const SharedDictionary mine = userInfo()) merged->merge(*mine);
   }
-  std::optional<std::string> failure;
+  std::optional<std::string> line;
   // A root has no ancestors, so it needs no look at them and no lock of the registry's.
   const bool toAncestor = getSessionHierarchy() > 0 &&
                           _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
-                            failure =
+                            line =
                                 ancestor.sendToAggregator(info, timestamp, category, type, std::move(merged));
                           });
   if (!toAncestor && hasAggregator()) {
-    failure = sendToAggregator(info, timestamp, category, type, std::move(merged));
+    line = sendToAggregator(info, timestamp, category, type, std::move(merged));
   }
-  logProxyFailure(failure);
+  if (line) logError("%s", line->c_str());
 }
 
 std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictionary& info, double timestamp,
@@ -126,18 +120,26 @@ std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictiona
     const Lock held(_mutex);
     connection = _connection;
   }
-  if (!connection) return "The session has ended.";
   std::optional<std::string> failure;
-  const auto proxy = connection->remoteObjectProxyWithErrorHandler(
-      [&failure](const std::string& description) { failure = description; });
-  proxy->sendMessageToClient(info ? OptionalDictionary(*info) : std::nullopt, timestamp, category, type,
-                             std::move(payload));
-  return failure;
+  if (connection) {
+    const auto proxy = connection->remoteObjectProxyWithErrorHandler(
+        [&failure](const std::string& description) { failure = description; });
+    proxy->sendMessageToClient(info ? OptionalDictionary(*info) : std::nullopt, timestamp, category, type,
+                               std::move(payload));
+  } else {
+    failure = "The session has ended.";
+    _services.counters.count("event dropped: the client has gone");
+  }
+  if (!failure) return std::nullopt;
+  const double now = platform::timevalToSeconds(_services.clock.now());
+  const Lock held(_mutex);
+  return _drops.dropped(*failure, now);
 }
 
-void VeltradSession::shutdownSessionAggregation() {
+std::optional<std::string> VeltradSession::shutdownSessionAggregation() {
   logDebug("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID());
-  if (_hasAggregator.exchange(false)) logProxyFailure(sendToAggregator(nullptr, 0, 0, 0, std::nullopt));
+  if (!_hasAggregator.exchange(false)) return std::nullopt;
+  return sendToAggregator(nullptr, 0, 0, 0, std::nullopt);
 }
 
 void VeltradSession::flushMessagesWithCompletion(FlushReply completion) {

@@ -269,7 +269,7 @@ void VeltradSession::end() {
   payload.setIfPresent("StorebagVersion", storebagVersion());
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
-  shutdownSessionAggregation();
+  std::optional<std::string> lastDrops = shutdownSessionAggregation();
   std::shared_ptr<const BackendSet> released;
   std::shared_ptr<Connection> connection;  // may be the last reference: goes after the lock
   {
@@ -279,7 +279,9 @@ void VeltradSession::end() {
     _sessionInfo = nullptr;
     _userInfo = nullptr;
     _storebagVersion = std::nullopt;
+    if (!lastDrops) lastDrops = _drops.rest();
   }
+  if (lastDrops) logError("%s", lastDrops->c_str());
   if (released) {
     for (const auto& [name, backend] : *released) backend->cleanup();
   }

@@ -15,6 +15,7 @@
 #include "platform/clock.h"
 #include "protocol/client_session_interface.h"
 #include "session/backend_set.h"
+#include "session/drop_lines.h"
 
 namespace veltrad {
 
@@ -84,7 +85,8 @@ class VeltradSession final : public ClientSessionInterface,
   void syncReportingStates();
   // Gives the back ends the ancestors' ID strings and this session's own, joined by ".".
   void updateCombinedSessionID();
-  void shutdownSessionAggregation();
+  // Tells the client that no more copies come, if any came. The line to log, once no lock is held.
+  [[nodiscard]] std::optional<std::string> shutdownSessionAggregation();
   // The client type of the session info, for the choice of a storebag; absent when it names none.
   std::optional<std::int32_t> clientType() const;
 
@@ -105,8 +107,8 @@ class VeltradSession final : public ClientSessionInterface,
   std::optional<std::string> sendMessageWithDictionary(const Dictionary& message);
   void aggregateMessage(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
                         std::uint16_t type, const Dictionary* payload);
-  // To this session's own client, without waiting; the registry's lock may be held. The reason why it could
-  // not be.
+  // To this session's own client, without waiting; the registry's lock may be held. The line to log, once no
+  // lock is held, about a copy that was lost.
   std::optional<std::string> sendToAggregator(const SharedDictionary& sessionInfo, double timestamp,
                                               std::uint16_t category, std::uint16_t type,
                                               OptionalDictionary payload);
@@ -137,6 +139,7 @@ class VeltradSession final : public ClientSessionInterface,
   SharedDictionary _userInfo GUARDED_BY(_mutex);
   std::shared_ptr<const BackendSet> _backends GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion GUARDED_BY(_mutex);
+  DropLines _drops GUARDED_BY(_mutex);  // of copies to this session's own client
 };
 
 }  // namespace veltrad
