@@ -1,5 +1,4 @@
 // What becomes of a dashboard datagram after its first transmission, on ticks and a time that the test sets.
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <set>
@@ -13,7 +12,6 @@ namespace veltrad {
 namespace {
 
 using namespace std::chrono_literals;
-using ::testing::ElementsAre;
 using Verdict = DeliverySchedule::Verdict;
 
 // A network that takes datagrams on some ticks only; the first transmission is tick 0.
@@ -40,14 +38,13 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
     std::set<int> closed;
     std::vector<int> sentAt;
     int leavesAt;  // 0: never waited
-    std::size_t givenUp;
   };
   for (const Case& c :
-       std::vector<Case>{{true, {}, {0, 2, 5, 10, 19}, 20, 1},
-                         {true, {2, 3}, {0, 4, 7, 12, 21}, 22, 1},     // a retransmission is tried again
-                         {true, {0, 1, 2}, {3, 5, 8, 13, 22}, 23, 1},  // counted from the first that went out
-                         {false, {}, {0}, 0, 0},                       // sent is done
-                         {false, {0, 1, 2}, {3}, 3, 0}}) {
+       std::vector<Case>{{true, {}, {0, 2, 5, 10, 19}, 20},
+                         {true, {2, 3}, {0, 4, 7, 12, 21}, 22},     // a retransmission is tried again
+                         {true, {0, 1, 2}, {3, 5, 8, 13, 22}, 23},  // counted from the first that went out
+                         {false, {}, {0}, 0},                       // sent is done
+                         {false, {0, 1, 2}, {3}, 3}}) {
     Network network(c.closed);
     MessageQueue queue(c.reliable, network.send());
     EXPECT_EQ(queue.tryToSendMsg("datagram", 1).sent, !c.closed.contains(0));
@@ -58,7 +55,7 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
     }
     EXPECT_EQ(network.sentAt, c.sentAt);
     EXPECT_EQ(network.now, c.leavesAt);
-    EXPECT_EQ(givenUp, c.givenUp);
+    EXPECT_EQ(givenUp, c.reliable ? 1u : 0u);
   }
 }
 
@@ -88,7 +85,7 @@ TEST(DashboardDelivery, AnAcknowledgementRemovesTheOldestOfItsNumber) {
   EXPECT_TRUE(queue.acknowledge(9));
   network.sent.clear();
   for (int i = 0; i < 2; ++i) ++network.now, queue.tick();
-  EXPECT_THAT(network.sent, ElementsAre("other", "newer"));
+  EXPECT_EQ(network.sent, (std::vector<std::string>{"other", "newer"}));
 }
 
 TEST(DashboardDelivery, TicksStandAtMultiplesAndOnlyWhileSomethingWaits) {
@@ -109,22 +106,16 @@ TEST(DashboardDelivery, CleanUpWaitsForDatagramsUntilTheLastResort) {
   DeliverySchedule idle(made, 500ms);
   EXPECT_EQ(idle.cleanup(false), Verdict::stop);
 
-  for (const bool drains : {true, false}) {
-    DeliverySchedule schedule(made, 500ms);
-    EXPECT_EQ(schedule.afterTick(made + 500ms, false), Verdict::goOn);
-    EXPECT_EQ(schedule.cleanup(true), Verdict::goOn);
-    // Acknowledged since: the next tick still comes, to stop.
-    EXPECT_EQ(schedule.next(made + 600ms, false), made + 1000ms);
-    EXPECT_EQ(schedule.afterTick(made + 1000ms, true), Verdict::lastResortScheduled);
-    EXPECT_EQ(schedule.afterTick(made + 1500ms, true), Verdict::goOn);
-    if (drains) {
-      EXPECT_EQ(schedule.afterTick(made + 2000ms, false), Verdict::stop);
-    } else {
-      EXPECT_FALSE(schedule.lastResortIsDue(made + 10'499ms));
-      EXPECT_EQ(schedule.next(made + 10'400ms, true), made + 10'500ms);
-      EXPECT_TRUE(schedule.lastResortIsDue(made + 10'500ms));
-    }
-  }
+  DeliverySchedule schedule(made, 500ms);
+  EXPECT_EQ(schedule.afterTick(made + 500ms, false), Verdict::goOn);
+  EXPECT_EQ(schedule.cleanup(true), Verdict::goOn);
+  EXPECT_EQ(schedule.next(made + 600ms, false), made + 1000ms);  // acknowledged since, but not stopped
+  EXPECT_EQ(schedule.afterTick(made + 1000ms, true), Verdict::lastResortScheduled);
+  EXPECT_EQ(schedule.afterTick(made + 1500ms, true), Verdict::goOn);
+  EXPECT_EQ(schedule.next(made + 10'400ms, true), made + 10'500ms);
+  EXPECT_FALSE(schedule.lastResortIsDue(made + 10'499ms));
+  EXPECT_TRUE(schedule.lastResortIsDue(made + 10'500ms));
+  EXPECT_EQ(schedule.afterTick(made + 10'500ms, false), Verdict::stop);
 }
 
 }  // namespace

@@ -38,8 +38,9 @@ struct World {
   DeviceIdentity device{properties};
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra library{files, preferences, root};
-  StandardBackendFactory factory{
-      {http, clock, random, locale, preferences, counters, settings, device, library, pool}};
+  const BackendServices services{http,     clock,    random, locale,  preferences,
+                                 counters, settings, device, library, pool};
+  StandardBackendFactory factory{services};
 
   void consent() { preferences.set("DiagnosticLogSubmissionEnabled", true); }
 };

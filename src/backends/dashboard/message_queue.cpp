@@ -57,6 +57,12 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   return false;
 }
 
+std::size_t MessageQueue::notSent() const {
+  return static_cast<std::size_t>(std::count_if(
+      _pending.begin(), _pending.end(),
+      [](const UDPPacketToSend& record) { return record.state() == UDPPacketToSend::notSent; }));
+}
+
 bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
   const auto record = std::find_if(_pending.begin(), _pending.end(), [&](const UDPPacketToSend& one) {
     return one.eventNumber() == eventNumber;

@@ -40,6 +40,8 @@ class MessageQueue {
 
   bool empty() const { return _pending.empty(); }
   std::size_t size() const { return _pending.size(); }
+  // Of those that wait, the ones that never went out.
+  std::size_t notSent() const;
 
  private:
   // True: the record leaves.

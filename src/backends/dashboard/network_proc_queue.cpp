@@ -12,6 +12,7 @@
 namespace veltrad {
 
 namespace {
+constexpr std::string_view kLost = "datagram lost: its back end ended before it was sent";
 constexpr int kMostReadAtOnce = 64;  // then the pool's other handlers have their turn
 constexpr std::size_t kEventIDAt = offsetof(tagReportingPacketHeader, eventID);
 
@@ -32,7 +33,10 @@ NetworkProcQueue::NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<p
 
 NetworkProcQueue::~NetworkProcQueue() {
   const Lock held(_mutex);
-  _counters.count("datagram lost: its back end ended first", _messageQueue.size());
+  const std::size_t notSent = _messageQueue.notSent();
+  _counters.count(kLost, notSent);
+  _counters.count("datagram given up: not acknowledged before its back end ended",
+                  _messageQueue.size() - notSent);
   _readSource.reset();  // before the socket that it watches
 }
 
@@ -46,7 +50,7 @@ bool NetworkProcQueue::startReading(platform::WorkPool& pool) {
 void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
   const Lock held(_mutex);
   if (!_timer) {
-    _counters.count("datagram lost: its back end ended first");
+    _counters.count(kLost);
     return;
   }
   const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber);

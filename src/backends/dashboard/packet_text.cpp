@@ -27,6 +27,10 @@ std::vector<Item> itemsInOrder(const Dictionary& payload) {
   return items;
 }
 
+bool isSpecial(char c) {
+  return c == '\n' || c == '\\' || c == '=';
+}
+
 // The field is a NUL-terminated text, so a NUL ends what is put into it.
 std::string_view untilNUL(std::string_view text) {
   return text.substr(0, text.find('\0'));
@@ -47,9 +51,9 @@ void PacketText::sanitize(std::string_view text) {
   if (text.find_first_not_of('\n') == std::string_view::npos) return put("empty");
   text = untilNUL(text);
   while (!text.empty() && !_cut) {
-    const std::size_t plain = std::min(text.find_first_of("\n\\="), text.size());
-    put(text.substr(0, plain));
-    text.remove_prefix(plain);
+    const auto plain = std::find_if(text.begin(), text.end(), isSpecial) - text.begin();
+    put(text.substr(0, static_cast<std::size_t>(plain)));
+    text.remove_prefix(static_cast<std::size_t>(plain));
     if (text.empty()) return;
     if (text.front() == '\\') put("\\\\");
     if (text.front() == '=') put("\\=");
