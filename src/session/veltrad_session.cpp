@@ -263,13 +263,23 @@ void VeltradSession::updateCombinedSessionID() {
   }
 }
 
+void VeltradSession::sayDroppedCopies() {
+  std::optional<std::string> line;
+  {
+    const Lock held(_mutex);
+    line = _drops.rest();
+  }
+  if (line) logError("%s", line->c_str());
+}
+
 void VeltradSession::end() {
   logDebug("dealloc: VeltradSession dealloc: %u", sessionID());
+  sayDroppedCopies();
   Dictionary payload;
   payload.setIfPresent("StorebagVersion", storebagVersion());
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
-  std::optional<std::string> lastDrops = shutdownSessionAggregation();
+  if (const auto line = shutdownSessionAggregation()) logError("%s", line->c_str());
   std::shared_ptr<const BackendSet> released;
   std::shared_ptr<Connection> connection;  // may be the last reference: goes after the lock
   {
@@ -279,9 +289,7 @@ void VeltradSession::end() {
     _sessionInfo = nullptr;
     _userInfo = nullptr;
     _storebagVersion = std::nullopt;
-    if (!lastDrops) lastDrops = _drops.rest();
   }
-  if (lastDrops) logError("%s", lastDrops->c_str());
   if (released) {
     for (const auto& [name, backend] : *released) backend->cleanup();
   }

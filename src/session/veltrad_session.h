@@ -112,6 +112,7 @@ class VeltradSession final : public ClientSessionInterface,
   std::optional<std::string> sendToAggregator(const SharedDictionary& sessionInfo, double timestamp,
                                               std::uint16_t category, std::uint16_t type,
                                               OptionalDictionary payload);
+  void sayDroppedCopies();
   std::optional<std::string> offerToBackends(const BackendSet& backends, const Dictionary* payload,
                                              platform::TimeValue time, std::uint16_t category,
                                              std::uint16_t type, std::int32_t flag);

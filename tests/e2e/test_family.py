@@ -1,0 +1,146 @@
+"""Sessions of one identity: combined IDs, states from the parent, copies to the one client that aggregates."""
+import time
+
+from harness import Wire, storebag, wait_until
+from test_https import NAMES, Client, HTTPSTest, entry
+
+ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
+BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
+PROXY = "<3>sendMessageWithDictionary: Failed to get remote object proxy: "
+END = {"timestamp": 0.0, "category": 0, "type": 0}
+
+
+class Member(Client):
+    """A session of the family, which keeps the copies that it gets."""
+
+    def __init__(self, root, client_type, aggregates=False, name="phone", service="ringer", batch=False):
+        Wire.__init__(self, root)
+        self.copies, self.number, self.client_type = [], next(self.numbers), client_type
+        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=aggregates,
+                 sessionInfo={"clientType": client_type, "sessionID": self.number, "requireUserInfo": True,
+                              "batchEvent": batch}, userInfo={"clientName": name, "serviceName": service})
+        self.backends = self.start()
+
+    def frame(self):
+        while (frame := super().frame()) and frame[0] == self.EVENT:
+            self.copies.append(frame[2]["args"])
+        return frame
+
+    def copies_now(self):
+        """What came since the last look; an answered call shows that it is all."""
+        self.ask("fetchDisplayURL:")
+        taken, self.copies = self.copies, []
+        return taken
+
+
+class Family(HTTPSTest):
+    def setUp(self):
+        super().setUp()
+        for level, client_type in enumerate(BAGS):
+            self.bag(client_type, entry(hierarchy=level, post_url="${url}/events/" + str(level)))
+
+    def bag(self, client_type, *entries, **more):
+        self.lab.put(BAGS[client_type], storebag(backends={"httppost": {"clients": list(entries)}, **more}))
+
+    def join(self, client_type, **options):
+        member = Member(self.root, client_type, **options)
+        self.addCleanup(member.close)
+        return member
+
+    def ids(self, level, events):
+        """The "_sessionID" of the newest events of a level."""
+        def found():
+            came = [event["_sessionID"] for post in self.posts(str(level)) for event in post["body"]["events"]]
+            return came[-1] if len(came) >= events else None
+        return wait_until(found, f"{events} events of level {level}")
+
+    def leave(self, daemon, member):
+        member.close()
+        daemon.wait_for_line(f"dealloc: VeltradSession dealloc: {member.number}")
+
+    def test_one_family_of_three_levels(self):
+        with self.serving():
+            root = self.join(ROOT, aggregates=True)
+            child = self.join(CHILD, aggregates=True, name="PHONE", service="Ringer")
+            self.assertEqual(child.copies_now(), [END])  # an ancestor aggregates: this one's copies end
+            grandchild = self.join(GRANDCHILD, name="Phone")
+            root.copies_now()
+            for number in range(3):
+                for member in (root, child, grandchild):
+                    member.message(number=number)
+            copies = root.copies_now()
+            self.assertEqual([(copy["sessionInfo"]["sessionID"], copy["payload"]["number"]) for copy in copies],
+                             [(member.number, number) for number in range(3) for member in (root, child, grandchild)])
+            self.assertEqual(copies[1]["payload"], {"number": 0, "clientName": "PHONE", "serviceName": "Ringer"})
+            self.assertEqual((child.copies_now(), grandchild.copies_now()), ([], []))
+            ids = [self.ids(level, 4).split(".") for level in range(3)]
+            self.assertEqual([len(each) for each in ids], [1, 2, 3])
+            self.assertEqual((ids[2][:2], ids[1][:1]), (ids[1], ids[0]))
+            # An equal number: the first that came stays the root, and a stranger belongs to no family.
+            late, stranger = self.join(ROOT, aggregates=True), self.join(GRANDCHILD, name="tablet")
+            late.copies_now(), root.copies_now()
+            child.message(number=9), stranger.message(number=9)
+            self.assertEqual([len(member.copies_now()) for member in (root, late, stranger)], [1, 0, 0])
+
+    def test_members_come_late_and_go(self):
+        with self.serving(PROXY + "The client has gone.") as daemon:  # the root's own last message
+            grandchild = self.join(GRANDCHILD, batch=True)
+            daemon.wait_for_line(f"<6>syncReportingStates: child session {grandchild.number} (backend httppost) with "
+                                 "hierarchy 2 is missing its parent")
+            grandchild.message(number=1)
+            child, root = self.join(CHILD), self.join(ROOT, aggregates=True)
+            daemon.wait_for_line("<6>parentSessionIDStringForSession: Found a gap in hierarchy (one of parents "
+                                 "missing): incomplete parentSessionID is ''")
+            self.assertEqual(grandchild.flush()[1:], (None, None))
+            self.assertEqual(self.ids(2, 2).count("."), 2)  # batched before the family was whole
+            root.copies_now()
+            child.states(clientName="tablet", serviceName="ringer")  # another identity: out of the family
+            child.message(number=2)
+            self.assertEqual(root.copies_now(), [])
+            grandchild.message(number=3)  # its root is found over the gap
+            self.assertEqual([copy["payload"]["number"] for copy in root.copies_now()], [3])
+            self.leave(daemon, root)
+            grandchild.message(number=4)
+            child.states(clientName="PHONE", serviceName="ringer")  # back: its root is missing, itself is not
+            grandchild.message(number=5)
+            self.assertEqual(grandchild.flush()[1:], (None, None))
+            self.assertEqual(self.ids(2, 5).count("."), 1)
+
+    # What the entries of parent and child say, the answer of the parent's collector, whether the child reports.
+    OUT, HELD = {"sampling_threshold": 0, "override_sampling": 0}, {"sampling_threshold": 0}
+    STATES = [({}, {}, 200, True), (OUT, {}, 200, False), (HELD, {}, 200, True), ({}, OUT, 200, True),
+              (OUT, HELD, 200, True), ({}, {}, 503, False)]
+
+    def test_states_come_from_the_parent(self):
+        def entries(level, which):
+            return [entry(f"case{number}", hierarchy=level, **case[which]) for number, case in enumerate(self.STATES)]
+        self.bag(ROOT, *entries(0, 0))
+        self.bag(CHILD, *entries(1, 1), httppost2={"clients": [entry(client=None, hierarchy=1)]})  # the parent lacks it
+        with self.serving() as daemon:
+            for number, (*_, status, reports) in enumerate(self.STATES):
+                with self.subTest(number):
+                    self.lab.control(path=f"/events/case{number}", status=status)
+                    root = self.join(ROOT, name=f"case{number}", batch=True)
+                    if status == 503:
+                        self.assertEqual(root.flush()[1], 503)
+                    child = self.join(CHILD, name=f"case{number}")
+                    self.assertEqual(child.backends, ["httppost"] * reports)
+            daemon.wait_for_line("<7>HTTPSPostBackend(syncReportingStates): httppost: state and sampling rate updated to 1")
+
+    def test_a_client_that_does_not_read_holds_up_nobody(self):
+        with self.serving(PROXY) as daemon:
+            root, child = self.join(ROOT, aggregates=True), self.join(CHILD)
+            root.copies_now()
+            begin, sent, text = time.monotonic(), 4000, "x" * 1000
+            for number in range(sent):
+                child.message(number=number, text=text)
+            took = time.monotonic() - begin
+            numbers = [copy["payload"]["number"] for copy in root.copies_now()]
+            self.assertEqual(numbers, list(range(len(numbers))))
+            self.assertLess(len(numbers), sent)
+            child.message(number=-1)
+            self.assertEqual([copy["payload"]["number"] for copy in root.copies_now()], [-1])
+            self.leave(daemon, root)
+        lines = [line for line in daemon.text if line.startswith(PROXY)]
+        self.assertTrue(1 <= len(lines) <= took + 3, lines)
+        self.assertEqual(self.counts()["event dropped: the client does not read"], sent - len(numbers))
