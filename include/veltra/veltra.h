@@ -200,6 +200,13 @@ VELTRA_API veltra_status veltra_session_send_one_shot_wait(veltra_session*, cons
 
 VELTRA_API veltra_status veltra_session_flush(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply** reply);
+/* `data` is an array, borrowed, of at most 64 MiB and 500,000 values. The answer, which comes when the
+ * servers have answered, says with veltra_reply_uploaded whether anybody took it; it has no error of its own.
+ */
+VELTRA_API veltra_status veltra_session_upload_log_data(veltra_session*, const veltra_value* data,
+                                                        veltra_callback, void* context);
+VELTRA_API veltra_status veltra_session_upload_log_data_wait(veltra_session*, const veltra_value* data,
+                                                             veltra_reply** reply);
 /* `user_info` is a dictionary or NULL: the session's new user info. */
 VELTRA_API veltra_status veltra_session_states(veltra_session*, const veltra_value* user_info,
                                                veltra_callback, void* context);

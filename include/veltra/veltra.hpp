@@ -303,6 +303,12 @@ class Session {
       return call(std::move(callback), &veltra_session_send_one_shot, &plain, category, type, payload.get());
     });
   }
+  // `data` is an array. Takes as long as the servers do; the reply's `uploaded` says whether anybody took it.
+  std::future<Reply> uploadLogData(const Value& data) {
+    return promised([&](Callback callback) {
+      return call(std::move(callback), &veltra_session_upload_log_data, data.get());
+    });
+  }
   Status start(Callback callback) { return call(std::move(callback), &veltra_session_start); }
   Status flush(Callback callback) { return call(std::move(callback), &veltra_session_flush); }
   Status states(const Value& userInfo, Callback callback) {

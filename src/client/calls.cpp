@@ -14,14 +14,15 @@ using Entries = std::vector<Dictionary::Entry>;
 
 // What the daemon reads at most, less the frame's own dictionaries around it.
 constexpr int kDeepestArgument = 60;
+constexpr std::size_t kObjectsAround = 100;
+constexpr std::size_t kMostLargeObjects = 500'000;
 
 bool absentOrDictionary(const veltra_value* value) {
   return !value || value->entries();
 }
 
-bool fits(const veltra_value* value) {
-  const PropertyListLimits limits;
-  return !value || (value->depth <= kDeepestArgument && value->objects < limits.objects - 100);
+bool fits(const veltra_value* value, std::size_t mostObjects = PropertyListLimits{}.objects) {
+  return !value || (value->depth <= kDeepestArgument && value->objects < mostObjects - kObjectsAround);
 }
 
 std::string mended(const char* text) {
@@ -53,16 +54,20 @@ Entries identity(const veltra_session_options& options) {
   return arguments;
 }
 
-}  // namespace
-
-CallFrame callFrame(const char* operation, Entries arguments) {
+CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries arguments) {
   Entries body;
   body.reserve(2);
   body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
   body.emplace_back("op", operation);
-  std::string frame = ipc::makeFrame(ipc::FrameKind::call, 0, Dictionary::fromEntries(std::move(body)));
-  if (frame.size() - ipc::kFrameHeaderBytes > ipc::kFrameBodyLimit) return {VELTRA_TOO_LARGE, {}};
+  std::string frame = ipc::makeFrame(kind, 0, Dictionary::fromEntries(std::move(body)));
+  if (!ipc::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
   return {VELTRA_OK, std::move(frame)};
+}
+
+}  // namespace
+
+CallFrame callFrame(const char* operation, Entries arguments) {
+  return frameOfKind(ipc::FrameKind::call, operation, std::move(arguments));
 }
 
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
@@ -108,6 +113,12 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
   if (payload) arguments.emplace_back("payload", dictionaryOfNode(payload));
   arguments.emplace_back("type", static_cast<unsigned>(type));
   return callFrame(kSendOneShot, std::move(arguments));
+}
+
+CallFrame logDataFrame(const veltra_value* data) {
+  if (!data || !data->items()) return {VELTRA_INVALID, {}};
+  if (!fits(data, kMostLargeObjects)) return {VELTRA_TOO_LARGE, {}};
+  return frameOfKind(ipc::FrameKind::largeCall, kUploadLogData, {{"data", valueOfNode(*data)}});
 }
 
 }  // namespace veltrad

@@ -19,6 +19,7 @@ inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:
 inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
 inline constexpr const char* kSendOneShot =
     "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
+inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
 inline constexpr const char* kSetSessionInfo =
     "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
 inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
@@ -40,5 +41,8 @@ CallFrame dictionaryFrame(const char* operation, const char* argument, const vel
 CallFrame sessionInfoFrame(const veltra_session_options& options);
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload);
+
+// `data` is an array; the one call whose frame may be a large one.
+CallFrame logDataFrame(const veltra_value* data);
 
 }  // namespace veltrad

@@ -166,6 +166,16 @@ veltra_status veltra_session_flush_wait(veltra_session* session, veltra_reply** 
   return sendAndWait(session, veltrad::callFrame(veltrad::kFlushMessages), reply);
 }
 
+veltra_status veltra_session_upload_log_data(veltra_session* session, const veltra_value* data,
+                                             veltra_callback callback, void* context) {
+  return send(session, veltrad::logDataFrame(data), callback, context);
+}
+
+veltra_status veltra_session_upload_log_data_wait(veltra_session* session, const veltra_value* data,
+                                                  veltra_reply** reply) {
+  return sendAndWait(session, veltrad::logDataFrame(data), reply);
+}
+
 veltra_status veltra_session_states(veltra_session* session, const veltra_value* user_info,
                                     veltra_callback callback, void* context) {
   return send(

@@ -82,6 +82,8 @@ TEST(Refusal, OfArgumentsSendsNothing) {
   EXPECT_EQ(send(number, 0), VELTRA_INVALID);
   EXPECT_EQ(veltra_session_send_dictionary(session.get(), nullptr, nullptr, nullptr), VELTRA_INVALID);
   EXPECT_EQ(veltra_session_states(session.get(), number.get(), nullptr, nullptr), VELTRA_INVALID);
+  EXPECT_EQ(veltra_session_upload_log_data_wait(session.get(), blownUp.get(), nullptr), VELTRA_INVALID);
+  EXPECT_EQ(veltra_session_upload_log_data_wait(session.get(), shared.get(), nullptr), VELTRA_TOO_LARGE);
   EXPECT_EQ(veltra_session_send_dictionary_wait(session.get(), large.get(), nullptr), VELTRA_TOO_LARGE);
   veltra_session_options who{};
   EXPECT_EQ(veltra_session_send_one_shot_wait(session.get(), &who, 1, 1, nullptr, nullptr), VELTRA_INVALID);

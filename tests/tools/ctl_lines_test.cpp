@@ -31,20 +31,25 @@ TEST(SessionLines, saysWhatIsWrong) {
       {R"({"op":"flush"} {})", "not JSON: at byte 15: "},
       {"[1]", "expected an object such as {\"op\":\"flush\"}, found an array"},
       {R"({"$date":1})", "found a date"},
-      {"{}", "no \"op\": expected one of send, flush, states, displayURL, restart, sleep, finish"},
+      {"{}",
+       "no \"op\": expected one of send, flush, states, displayURL, uploadLogData, "
+       "restart, sleep, finish"},
       {R"({"op":5})", "\"op\": expected a text, found an integer"},
       {R"({"op":"Send"})", "unknown op \"Send\": expected one of send,"},
       {R"({"op":"send","payload":{"$data":"AAE="}})", "\"payload\" of send: expected an object, found data"},
       {R"({"op":"send","flag":"3"})", "\"flag\" of send: expected an integer, found a text"},
       {R"({"op":"send","flag":1.5})", "of send: expected an integer, found a number with a fraction"},
       {R"({"op":"states","userInfo":[]})", "\"userInfo\" of states: expected an object, found an array"},
+      {R"({"op":"uploadLogData"})", "no \"data\" in uploadLogData: expected an array"},
+      {R"({"op":"uploadLogData","data":{}})",
+       "\"data\" of uploadLogData: expected an array, found an object"},
       {R"({"op":"sleep"})", "no \"ms\" in sleep: expected an integer from 0 to 3600000"},
       {R"({"op":"sleep","ms":true})",
        "\"ms\" of sleep: expected an integer from 0 to 3600000, found a boolean"},
       {R"({"op":"sleep","ms":3600001})", "expected an integer from 0 to 3600000, found 3600001"},
       {R"({"op":"send","payload":{"a":[{"b\u0000c":1}]}})", "a key holds a NUL character"},
       {R"({"op":"flush"})" + std::string(kLongestLine, ' '),
-       "the line is too long: expected at most 1048576 bytes"},
+       "the line is too long: expected at most 67108864 bytes"},
   };
   for (const auto& [text, description] : cases) {
     const auto line = parseSessionLine(text);
@@ -72,6 +77,8 @@ TEST(Answers, standInOneLineOpFirst) {
       {formatAnswer(Operation::send, withError(VELTRA_NO_REPLY)), R"({"op":"send","reply":null,)" + error},
       // The call was answered, so what stands in its error is no answer to a send.
       {formatAnswer(Operation::send, withError(VELTRA_OK)), R"({"op":"send","reply":null})"},
+      {formatAnswer(Operation::uploadLogData, {VELTRA_OK, {}, {}, {}, true}),
+       R"({"op":"uploadLogData","uploaded":true,"error":null})"},
       {formatAnswer(Operation::flush, withError(VELTRA_OK)), R"({"op":"flush","reply":null,)" + error},
       {formatMalformedLine(12, "op \"x\""), R"({"op":"error","line":12,"description":"op \"x\""})"},
       {formatAggregated({Dictionary{{"sessionID", 42u}}, 1416171234.25, 5, 65535,

@@ -57,11 +57,14 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
     case Operation::finish:
       text += ",\"reply\":" + formatReply(answer.reply);
       break;
+    case Operation::uploadLogData:
+      text += answer.uploaded ? ",\"uploaded\":true" : ",\"uploaded\":false";
+      break;
     case Operation::sleep:
       break;
   }
-  if (operation == Operation::flush || answer.status != VELTRA_OK)
-    text += ",\"error\":" + formatError(answer.error);
+  const bool alwaysWithError = operation == Operation::flush || operation == Operation::uploadLogData;
+  if (alwaysWithError || answer.status != VELTRA_OK) text += ",\"error\":" + formatError(answer.error);
   return text + '}';
 }
 

@@ -25,6 +25,7 @@ struct Answer {
   std::optional<std::string> reply;
   std::optional<std::vector<std::string>> backends;
   std::optional<AnswerError> error;
+  bool uploaded = false;
 };
 
 // A copy of a message, for a session that aggregates. All empty: aggregation has ended.
@@ -39,8 +40,8 @@ struct AggregatedCopy {
 // For a call that never left: the status in words.
 Answer answerOfFailure(veltra_status status);
 
-// JSON without a line break, "op" first. "error" stands in every answer of a flush, and in others only when
-// the call ended without an answer.
+// JSON without a line break, "op" first. "error" stands in every answer of a flush and of uploaded log data,
+// and in others only when the call ended without an answer.
 std::string formatAnswer(Operation operation, const Answer& answer);
 // {"op":"aggregated","sessionInfo":…,"timestamp":…,"category":…,"type":…,"payload":…}; null where absent.
 std::string formatAggregated(const AggregatedCopy& copy);

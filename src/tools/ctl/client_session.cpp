@@ -28,6 +28,7 @@ Answer answerOf(const veltra_reply* reply) {
   std::size_t length = 0;
   if (const char* text = veltra_reply_text(reply, &length)) answer.reply.emplace(text, length);
   if (const veltra_value* backends = veltra_reply_backends(reply)) answer.backends = textsOf(backends);
+  answer.uploaded = veltra_reply_uploaded(reply);
   const char* domain = veltra_reply_error_domain(reply);
   const char* description = veltra_reply_error_description(reply);
   if (domain && description) answer.error = AnswerError{domain, veltra_reply_error_code(reply), description};
@@ -142,6 +143,13 @@ std::optional<Answer> ClientSession::states(const std::optional<Dictionary>& use
 std::optional<Answer> ClientSession::displayURL() {
   return await([this](veltra_callback callback, void* context) {
     return veltra_session_display_url(_session, callback, context);
+  });
+}
+
+std::optional<Answer> ClientSession::uploadLogData(const Array& data) {
+  const VeltraValue value = toVeltraValue(Value(data));
+  return await([this, &value](veltra_callback callback, void* context) {
+    return veltra_session_upload_log_data(_session, value.get(), callback, context);
   });
 }
 

@@ -41,6 +41,7 @@ class ClientSession {
   std::optional<Answer> flush();
   std::optional<Answer> states(const std::optional<Dictionary>& userInfo);
   std::optional<Answer> displayURL();
+  std::optional<Answer> uploadLogData(const Array& data);
   std::optional<Answer> finish();
 
   // Waits for at most 2 s. Returns how many calls were lost unwritten.

@@ -3,7 +3,18 @@
 
 namespace veltrad::ctl {
 
-enum class Operation { start, send, oneShot, flush, states, displayURL, restart, sleep, finish };
+enum class Operation {
+  start,
+  send,
+  oneShot,
+  flush,
+  states,
+  displayURL,
+  uploadLogData,
+  restart,
+  sleep,
+  finish
+};
 
 // The "op" of a line and of its answer.
 constexpr const char* operationName(Operation operation) {
@@ -20,6 +31,8 @@ constexpr const char* operationName(Operation operation) {
       return "states";
     case Operation::displayURL:
       return "displayURL";
+    case Operation::uploadLogData:
+      return "uploadLogData";
     case Operation::restart:
       return "restart";
     case Operation::sleep:

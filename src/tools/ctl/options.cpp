@@ -17,7 +17,8 @@ namespace veltrad::ctl {
 namespace {
 
 constexpr int kWrongUsage = 2;
-constexpr const char* kExpectedCommands = "expected session, send, one-shot, states, display-url or stats";
+constexpr const char* kExpectedCommands =
+    "expected session, send, one-shot, states, display-url, upload-log-data or stats";
 
 // As they stand on the command line, before they are put together.
 struct Texts {
@@ -94,6 +95,7 @@ constexpr const char* kSessionFooter = R"(One JSON object a line, answered by on
   {"op":"flush"}
   {"op":"states","userInfo":{"clientName":"phone"}}
   {"op":"displayURL"}
+  {"op":"uploadLogData","data":[{"file":"a.log"},1]}
   {"op":"restart"}            start again
   {"op":"sleep","ms":100}
   {"op":"finish"}             the end of the input closes without it
@@ -105,7 +107,7 @@ With --aggregate the copies stand between the answers, one a line, null where th
 Example:
   echo '{"op":"flush"}' | veltractl session --client-type 7 --client phone --service ringer)";
 
-// Calls the one positional argument by its form and subcommands by their usual name.
+// Calls a positional argument by its form and subcommands by their usual name.
 class Help : public CLI::Formatter {
  public:
   Help() {
@@ -113,7 +115,8 @@ class Help : public CLI::Formatter {
     column_width(34);
   }
   std::string make_option_name(const CLI::Option* option, bool positional) const override {
-    return positional ? "KEY=VALUE" : Formatter::make_option_name(option, positional);
+    if (!positional) return Formatter::make_option_name(option, positional);
+    return option->get_name() == "payload" ? "KEY=VALUE" : "FILE";
   }
 };
 
@@ -183,6 +186,19 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
   stats->footer("Examples:\n  veltractl stats\n  veltractl --json stats");
 }
 
+void addUploads(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* logData =
+      addCommand(app, options, Command::uploadLogData, "upload-log-data", "Upload an array of log data");
+  logData
+      ->add_option("file", options.file, "The array as JSON; {\"$date\": …} and {\"$data\": …} as in session")
+      ->type_name("")
+      ->required();
+  addIdentity(*logData, options.identity, texts, true);
+  logData->footer(
+      "Waits for the servers. Exit status 1, too, when nobody took it.\n\n"
+      "Example:\n  veltractl upload-log-data --client-type 7 logs.json");
+}
+
 void addGlobals(CLI::App& app, Options& options) {
   app.add_option("--root", options.root, "Directory that holds run/veltrad [VELTRA_ROOT, else /]")
       ->type_name("DIR")
@@ -246,6 +262,7 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   addSend(app, options, texts);
   addOneShot(app, options, texts);
   addQuestions(app, options, texts);
+  addUploads(app, options, texts);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {

@@ -3,52 +3,17 @@
 
 #include <fmt/format.h>
 
-#include <algorithm>
-
 #include "base/json.h"
+#include "tools/ctl/given_values.h"
 
 namespace veltrad::ctl {
 namespace {
 
-constexpr Operation kOperations[] = {Operation::send,       Operation::flush,   Operation::states,
-                                     Operation::displayURL, Operation::restart, Operation::sleep,
-                                     Operation::finish};
+constexpr Operation kOperations[] = {Operation::send,       Operation::flush,         Operation::states,
+                                     Operation::displayURL, Operation::uploadLogData, Operation::restart,
+                                     Operation::sleep,      Operation::finish};
 constexpr const char* kExpectedOperations =
-    "expected one of send, flush, states, displayURL, restart, sleep, finish";
-
-const char* typeName(const Value& value) {
-  switch (value.type()) {
-    case Value::Type::boolean:
-      return "a boolean";
-    case Value::Type::signedInteger:
-    case Value::Type::unsignedInteger:
-      return "an integer";
-    case Value::Type::real:
-      return "a number with a fraction";
-    case Value::Type::string:
-      return "a text";
-    case Value::Type::date:
-      return "a date";
-    case Value::Type::data:
-      return "data";
-    case Value::Type::array:
-      return "an array";
-    case Value::Type::dictionary:
-      return "an object";
-  }
-  return "something else";
-}
-
-// The C interface takes keys that end at their first NUL.
-bool hasUnsendableKey(const Value& value) {
-  if (const Array* array = value.asArray())
-    return std::any_of(array->begin(), array->end(), hasUnsendableKey);
-  const Dictionary* dictionary = value.asDictionary();
-  return dictionary &&
-         std::any_of(dictionary->begin(), dictionary->end(), [](const Dictionary::Entry& entry) {
-           return entry.first.find('\0') != std::string::npos || hasUnsendableKey(entry.second);
-         });
-}
+    "expected one of send, flush, states, displayURL, uploadLogData, restart, sleep, finish";
 
 // What is wrong with the field; nothing when it is absent or an object.
 std::optional<std::string> objectProblem(Operation operation, const Dictionary& line, const char* key) {
@@ -80,6 +45,18 @@ Result<SessionLine, std::string> parseStates(const Dictionary& line) {
   SessionLine result;
   result.operation = Operation::states;
   if (const Dictionary* userInfo = line.dictionary("userInfo")) result.userInfo = *userInfo;
+  return result;
+}
+
+Result<SessionLine, std::string> parseUploadLogData(const Dictionary& line) {
+  const Value* data = line.find("data");
+  if (!data) return Failure{std::string("no \"data\" in uploadLogData: expected an array")};
+  const Array* array = data->asArray();
+  if (!array)
+    return Failure{fmt::format("\"data\" of uploadLogData: expected an array, found {}", typeName(*data))};
+  SessionLine result;
+  result.operation = Operation::uploadLogData;
+  result.data = *array;
   return result;
 }
 
@@ -136,6 +113,8 @@ Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
       return parseSend(*fields);
     case Operation::states:
       return parseStates(*fields);
+    case Operation::uploadLogData:
+      return parseUploadLogData(*fields);
     case Operation::sleep:
       return parseSleep(*fields);
     default:

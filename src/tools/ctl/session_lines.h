@@ -12,14 +12,15 @@
 
 namespace veltrad::ctl {
 
-// Bytes of a line without its line break; a longer one is malformed.
-inline constexpr std::size_t kLongestLine = 1u << 20;
+// Bytes of a line without its line break, as many as the largest call has; a longer one is malformed.
+inline constexpr std::size_t kLongestLine = 64u << 20;
 inline constexpr std::chrono::milliseconds kLongestSleep = std::chrono::hours(1);
 
 struct SessionLine {
   Operation operation = Operation::flush;  // never start
   Dictionary message;                      // send: the line without "op"
   std::optional<Dictionary> userInfo;      // states
+  Array data;                              // uploadLogData
   std::chrono::milliseconds duration{0};   // sleep
 };
 
