@@ -52,7 +52,8 @@ struct Configuration {
   FakeFileStore files;
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra veltra{files, preferences, root};
-  platform::HTTPResult answer = FakeHTTPClient::error(platform::HTTPError::Kind::transport, "Could not resolve host: bags.test");
+  platform::HTTPResult answer =
+      FakeHTTPClient::error(platform::HTTPError::Kind::transport, "Could not resolve host: bags.test");
   std::vector<platform::HTTPRequest> requests;  // those that were answered
   FakeHTTPClient client{[this](const platform::HTTPRequest& request) {
     requests.push_back(request);

@@ -142,26 +142,15 @@ TEST(StorebagKey, TakesPublicKeysInBoundsAlone) {
   const std::string info = good.encoded();
   for (const std::string& form : {info, good.encoded("type-specific")})
     EXPECT_TRUE(verifySignature(form, kBag, good.sign(kBag)));
-  const Table table = {
-      {"nothing", ""},
-
-      {"2,047 bits", keyOf(2'047)},
-      {"8,193 bits", keyOf(8'193)},
-
-      {"an exponent of 1", keyOf(2'048, "\1")},
-      {"an even exponent", keyOf(2'048, "\4")},
-      {"PEM", good.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM")},
-      {"a private key", good.encoded("type-specific", EVP_PKEY_KEYPAIR)},
-      {"a private key info", good.encoded("PrivateKeyInfo", EVP_PKEY_KEYPAIR)},
-      {"cut short", info.substr(0, info.size() - 1)},
-      {"a byte behind", info + "\0"s},
-
-      {"an elliptic curve", RSAKey(EVP_EC_gen("P-256")).encoded()},
-      {"a key for another padding", infoOf(10, "")},
-  };
-  for (const auto& [what, bytes] : table) {
-    EXPECT_FALSE(StorebagKey::fromDER(bytes)) << what;
-    EXPECT_FALSE(verifySignature(bytes, kBag, good.sign(kBag))) << what;
+  for (const std::string& bytes :
+       {std::string(), keyOf(2'047), keyOf(8'193), keyOf(2'048, "\1"), keyOf(2'048, "\4"),
+        good.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM"),
+        good.encoded("type-specific", EVP_PKEY_KEYPAIR), good.encoded("PrivateKeyInfo", EVP_PKEY_KEYPAIR),
+        info.substr(0, info.size() - 1), info + "\0"s,
+        RSAKey(EVP_EC_gen("P-256")).encoded(),  // no RSA
+        infoOf(10, "")}) {
+    EXPECT_FALSE(StorebagKey::fromDER(bytes)) << bytes.size();
+    EXPECT_FALSE(verifySignature(bytes, kBag, good.sign(kBag)));
   }
 }
 
