@@ -84,12 +84,10 @@ TEST_F(MachinePropertiesTest, NamesTheClassOfTheDevice) {
 }
 
 TEST(MachineFacts, KnowsChassisTypes) {
-  const std::pair<int, Text> cases[] = {{0, {}},         {1, {}},          {2, {}},
-                                        {3, "Desktop"},  {9, "Laptop"},    {11, "Handset"},
-                                        {17, "Server"},  {23, "Server"},   {30, "Tablet"},
-                                        {31, "Laptop"},  {34, "Embedded"}, {3 | 0x80, "Desktop"},
-                                        {35, "Desktop"}, {99, {}}};
-  for (const auto& [type, name] : cases) EXPECT_EQ(deviceNameOfChassisType(type), name) << type;
+  std::string names;
+  for (const int type : {0, 1, 2, 3, 9, 11, 17, 23, 30, 31, 34, 3 | 0x80, 35, 99})
+    names += deviceNameOfChassisType(type).value_or("-") + " ";
+  EXPECT_EQ(names, "- - - Desktop Laptop Handset Server Server Tablet Laptop Embedded Desktop Desktop - ");
 }
 
 TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChanges) {
@@ -106,10 +104,10 @@ TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChange
 }
 
 TEST(Locale, FindsTheCountryInALocaleName) {
-  const std::pair<const char*, Text> cases[] = {{"de_DE.UTF-8", "DE"}, {"de_DE", "DE"},
-                                                {"de_DE@euro", "DE"},  {"es_419", "419"},
-                                                {"en_gb", "GB"},       {"ca_ES.UTF-8@valencia", "ES"}};
-  for (const auto& [name, country] : cases) EXPECT_EQ(countryOfLocaleName(name), country) << name;
+  std::string countries;
+  for (const char* name : {"de_DE.UTF-8", "de_DE", "de_DE@euro", "es_419", "en_gb", "ca_ES.UTF-8@valencia"})
+    countries += countryOfLocaleName(name).value_or("-") + " ";
+  EXPECT_EQ(countries, "DE DE DE 419 GB ES ");
   for (const char* name : {"C", "POSIX", "C.UTF-8", "eo", "eo.UTF-8", "_DE", "de_", "de_DEU", "de_D1",
                            "C.x_DE", "", "de_\xc3\x9c"})
     EXPECT_EQ(countryOfLocaleName(name), Text()) << name;

@@ -72,7 +72,6 @@ TEST_F(DiskFileStoreTest, ReadsWithinItsBoundAndRegularFilesAlone) {
   const auto missing = _files.read(_directory.path("none"), kMost);
   EXPECT_EQ(missing.error().kind, Kind::notFound);
   EXPECT_EQ(missing.error().description, _directory.path("none") + ": No such file or directory");
-  EXPECT_EQ(_files.read(_directory.path("x/below"), kMost).error().kind, Kind::notFound);
 
   // A size of 0 is no promise.
   EXPECT_FALSE(_files.read("/proc/self/status", kMost).value().empty());
@@ -94,18 +93,6 @@ TEST_F(DiskFileStoreTest, TheStampChangesWithEveryKindOfChange) {
   ASSERT_FALSE(_files.rename(path, path + ".corrupt"));
   EXPECT_FALSE(_files.stamp(path));
   EXPECT_EQ(_directory.read("x.corrupt"), "12");
-}
-
-TEST_F(DiskFileStoreTest, MakesDirectoriesAndSaysWhatIsInTheWay) {
-  EXPECT_FALSE(makeDirectories(_directory.path("a/b/c")));
-  EXPECT_FALSE(makeDirectories(_directory.path("a/b/c")));
-  EXPECT_TRUE(std::filesystem::is_directory(_directory.path("a/b/c")));
-  _directory.write("file", "");
-  for (const char* below : {"file", "file/x"}) {
-    const auto failure = makeDirectories(_directory.path(below));
-    ASSERT_TRUE(failure) << below;
-    EXPECT_THAT(failure->description, HasSubstr("Not a directory")) << below;
-  }
 }
 
 }  // namespace
