@@ -12,7 +12,7 @@ std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
     std::int32_t) {
   if (name == kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName(_services, name, profile.asDictionary(),
+    return DashboardBackend::initWithName(_services, _uploads, name, profile.asDictionary(),
                                           productFamily.value_or(""));
   }
   if (name == kVeltraBackendHTTPPost || name == kVeltraBackendHTTPPost2) {

@@ -1,4 +1,4 @@
-// Makes backends by name. Any thread; constant after construction.
+// Makes backends by name. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -6,6 +6,7 @@
 #include <string>
 
 #include "backends/backend.h"
+#include "backends/dashboard/log_data_uploads.h"
 
 namespace veltrad {
 
@@ -46,13 +47,14 @@ class BackendFactory {
 
 class StandardBackendFactory final : public BackendFactory {
  public:
-  explicit StandardBackendFactory(BackendServices services) : _services(services) {}
+  explicit StandardBackendFactory(BackendServices services) : _services(services), _uploads(services.http) {}
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType) override;
 
  private:
   const BackendServices _services;
+  LogDataUploads _uploads;
 };
 
 }  // namespace veltrad

@@ -7,6 +7,7 @@
 #include <future>
 
 #include "backends/dashboard/dashboard_backend.h"
+#include "backends/dashboard/log_data_uploads.h"
 #include "base/property_list.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
@@ -73,8 +74,9 @@ class Dashboard : public ::testing::Test {
 };
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
+  LogDataUploads uploads(world.http);
   const auto direct =
-      DashboardBackend::initWithName(world.services, "direct", "127.0.0.1"s, server.port, "Desktop");
+      DashboardBackend::initWithName(world.services, uploads, "direct", "127.0.0.1"s, server.port, "Desktop");
   const std::pair<std::shared_ptr<VeltraBackend>, char> cases[] = {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
@@ -222,6 +224,13 @@ TEST_F(Dashboard, LogDataIsPostedAndItsPlaceAnnounced) {
   const std::string datagram = server.receive();  // the first one of this back end
   EXPECT_EQ(datagram.substr(16, 4) + datagram.substr(60),
             "\0\0\0\2\0\1\0\0 LogDataUploadLocation=/logs/123"s);
+
+  const Array large{std::string(LogDataUploads::kMostBytes / 2, 'x')};
+  auto first = std::async(std::launch::async, [&] { return backend->uploadLogData(large); });
+  EXPECT_TRUE(world.http.waitForRequest());
+  log.expectLine(Level::error, "array (Too many log data uploads under way)");
+  EXPECT_FALSE(make({{"post_url", "https://l.example/"}})->uploadLogData(large));
+  EXPECT_TRUE(world.http.answerNext(FakeHTTPClient::response(200, "/logs/124")) && first.get());
 
   log.expectLine(Level::error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
   EXPECT_FALSE(make()->uploadLogData(logData));

@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <cstring>
 
-#include "backends/dashboard/log_data_upload.h"
+#include "backends/dashboard/log_data_uploads.h"
 #include "backends/dashboard/text_line.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
@@ -51,38 +51,38 @@ std::optional<sockaddr_in> addressOf(const Dictionary& profile) {
 }  // namespace
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const BackendServices& services,
+                                                                 LogDataUploads& uploads,
                                                                  const std::string& name,
                                                                  const Dictionary* profile,
                                                                  const std::string& productFamily) {
   const auto port = profile ? profile->uint16("port").value_or(0) : std::uint16_t{0};
-  return initWithName(services, name, profile, textOf(profile, "ip"), port, productFamily);
-}
-
-std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const BackendServices& services,
-                                                                 const std::string& name,
-                                                                 const std::optional<std::string>& serverIP,
-                                                                 std::uint16_t serverPort,
-                                                                 const std::string& productFamily) {
-  if (!serverIP) return nullptr;
-  return initWithName(services, name, nullptr, serverIP, serverPort, productFamily);
+  return initWithName(services, uploads, name, profile, textOf(profile, "ip"), port, productFamily);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
-    const BackendServices& services, const std::string& name, const Dictionary* profile,
+    const BackendServices& services, LogDataUploads& uploads, const std::string& name,
     const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
+  if (!serverIP) return nullptr;
+  return initWithName(services, uploads, name, nullptr, serverIP, serverPort, productFamily);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
+    const BackendServices& services, LogDataUploads& uploads, const std::string& name,
+    const Dictionary* profile, const std::optional<std::string>& serverIP, std::uint16_t serverPort,
+    const std::string& productFamily) {
   auto network = openNetwork(services, profile, serverIP, serverPort);
   if (!network) return nullptr;
   std::shared_ptr<DashboardBackend> backend(
-      new DashboardBackend(services, name, profile, productFamily, std::move(*network)));
+      new DashboardBackend(services, uploads, name, profile, productFamily, std::move(*network)));
   backend->setDisplayURL(textOf(profile, "display_url"));
   return backend;
 }
 
-DashboardBackend::DashboardBackend(const BackendServices& services, const std::string& name,
-                                   const Dictionary* profile, const std::string& productFamily,
-                                   Network network)
+DashboardBackend::DashboardBackend(const BackendServices& services, LogDataUploads& uploads,
+                                   const std::string& name, const Dictionary* profile,
+                                   const std::string& productFamily, Network network)
     : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
-      _http(services.http),
+      _uploads(uploads),
       _clock(services.clock),
       _counters(services.counters),
       _reliableUDP(network.reliableUDP),
@@ -170,7 +170,7 @@ tagReportingPacketHeader DashboardBackend::headerOf(platform::TimeValue timestam
 }
 
 bool DashboardBackend::uploadLogData(const Array& logData) {
-  const auto location = uploadedLogDataLocation(_http, _postURL, logData);
+  const auto location = _uploads.upload(_postURL, logData);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
   sendMessage(&payload, _clock.now(), 0, 2, 0);

@@ -14,6 +14,8 @@
 
 namespace veltrad {
 
+class LogDataUploads;
+
 // Null from an initialiser: it cannot work so; one error line has said why.
 class DashboardBackend final : public VeltraBackend {
  public:
@@ -21,17 +23,19 @@ class DashboardBackend final : public VeltraBackend {
   // (for log data) and "reliable": present switches acknowledgements on; its value, from 1 on, is the period
   // of the ticks in milliseconds, else 500.
   static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        const std::string& name, const Dictionary* profile,
+                                                        LogDataUploads& uploads, const std::string& name,
+                                                        const Dictionary* profile,
                                                         const std::string& productFamily);
   // To a server named outright, with acknowledgements and a period of 500 ms.
   static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        const std::string& name,
+                                                        LogDataUploads& uploads, const std::string& name,
                                                         const std::optional<std::string>& serverIP,
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
   // A profile goes before the server named.
   static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        const std::string& name, const Dictionary* profile,
+                                                        LogDataUploads& uploads, const std::string& name,
+                                                        const Dictionary* profile,
                                                         const std::optional<std::string>& serverIP,
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
@@ -51,8 +55,8 @@ class DashboardBackend final : public VeltraBackend {
     bool reliableUDP = false;
   };
 
-  DashboardBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
-                   const std::string& productFamily, Network network);
+  DashboardBackend(const BackendServices& services, LogDataUploads& uploads, const std::string& name,
+                   const Dictionary* profile, const std::string& productFamily, Network network);
 
   static std::optional<Network> openNetwork(const BackendServices& services, const Dictionary* profile,
                                             const std::optional<std::string>& serverIP,
@@ -62,7 +66,7 @@ class DashboardBackend final : public VeltraBackend {
                                     std::uint16_t respCode, std::uint16_t eventID) const;
 
   // Constant after construction.
-  platform::HTTPClient& _http;
+  LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
   const bool _reliableUDP;
