@@ -94,20 +94,20 @@ void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_
 
 void VeltradSession::aggregateMessage(const SharedDictionary& info, double timestamp, std::uint16_t category,
                                       std::uint16_t type, const Dictionary* payload) {
-  OptionalDictionary merged;
-  if (payload) {
-    merged = *payload;
-    if (const SharedDictionary mine = userInfo()) merged->merge(*mine);
-  }
+  const auto merged = [&]() -> OptionalDictionary {
+    if (!payload) return std::nullopt;
+    Dictionary all = *payload;
+    if (const SharedDictionary mine = userInfo()) all.merge(*mine);
+    return all;
+  };
   std::optional<std::string> line;
   // A root has no ancestors, so it needs no look at them and no lock of the registry's.
   const bool toAncestor = getSessionHierarchy() > 0 &&
                           _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
-                            line =
-                                ancestor.sendToAggregator(info, timestamp, category, type, std::move(merged));
+                            line = ancestor.sendToAggregator(info, timestamp, category, type, merged());
                           });
   if (!toAncestor && hasAggregator()) {
-    line = sendToAggregator(info, timestamp, category, type, std::move(merged));
+    line = sendToAggregator(info, timestamp, category, type, merged());
   }
   if (line) logError("%s", line->c_str());
 }
