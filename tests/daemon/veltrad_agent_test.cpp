@@ -6,7 +6,6 @@
 #include <thread>
 
 #include "config/storebag_source.h"
-#include "daemon/user_info_key.h"
 #include "fakes/fake_backends.h"
 #include "fakes/fake_connection.h"
 #include "fakes/fake_transaction.h"
@@ -148,14 +147,6 @@ TEST_F(Agent, AnEmptiedListStaysAndALeavingSessionIsForgotten) {
   EXPECT_EQ(agent.userInfoKeyCount(), 2u);
 }
 
-TEST_F(Agent, KeysIgnoreCase) {
-  const Dictionary one{{"clientName", "Älpha"}, {"serviceName", "Beta"}};
-  const Dictionary other{{"clientName", "äLPHA"}, {"serviceName", "BETA"}};
-  EXPECT_EQ(userInfoKeyForUserInfo(&one), "älpha:beta");
-  EXPECT_EQ(userInfoKeyForUserInfo(&one), userInfoKeyForUserInfo(&other));
-  EXPECT_EQ(userInfoKeyForUserInfo(nullptr), ":");
-}
-
 TEST_F(Agent, TypesThatShareAStorebagShareOneDownload) {
   const auto first = connect(7);
   const auto second = connect(13);
@@ -229,100 +220,6 @@ TEST_F(Agent, OthersGoOnDuringADownloadAndTheSameNameWaits) {
   EXPECT_EQ(source.fetches, 1);
   EXPECT_NE(first, nullptr);
   EXPECT_EQ(first, second);
-}
-
-// A family of one key: each member's session with one back end of the given level, state and threshold.
-class Family : public Agent {
- protected:
-  struct Member {
-    std::shared_ptr<FakeConnection> connection;
-    std::shared_ptr<VeltradSession> session;
-    std::shared_ptr<FakeBackend> backend;
-    std::string id() const { return session->sessionIDString(); }
-    std::string combined() const { return backend->combinedSessionIDString().value_or("(none)"); }
-  };
-  Member join(std::int32_t level, bool aggregates = false, std::int32_t state = kBackendReporting,
-              double threshold = 1, const char* name = "httppost") {
-    source.age = 0;  // each member gets a section of its own
-    source.section =
-        Dictionary{{name, Dictionary{{"hierarchy", level}, {"state", state}, {"threshold", threshold}}}};
-    Member made;
-    made.connection = connect();
-    made.session = std::dynamic_pointer_cast<VeltradSession>(made.connection->session);
-    made.session->setSessionInfo(
-        Dictionary{{"clientType", 7}, {"sessionID", level}, {"requireUserInfo", true}},
-        Dictionary{{"clientName", "Alpha"}, {"serviceName", level % 2 ? "BETA" : "beta"}}, std::nullopt,
-        aggregates);
-    made.session->startConfigWithCompletionHandler(nullptr);
-    made.backend = backends.last[name];
-    return made;
-  }
-  static void send(const Member& member, std::uint16_t type) {
-    member.session->sendMessageWithCategory(5, type, Dictionary{{"n", int{type}}}, nullptr);
-  }
-};
-
-TEST_F(Family, CombinedIDsFollowTheChainAndItsGaps) {
-  const Member grandchild = join(2);
-  EXPECT_EQ(grandchild.combined(), grandchild.id());
-  EXPECT_EQ(log.count(RecordedLog::Level::info,
-                      "Found a gap in hierarchy (one of parents missing): incomplete "
-                      "parentSessionID is ''"),
-            1);
-  const Member child = join(1);
-  EXPECT_EQ(child.combined(), child.id());
-  EXPECT_EQ(grandchild.combined(), child.id() + "." + grandchild.id());
-  const Member root = join(0);
-  join(0);  // of equal numbers the earliest counts
-  EXPECT_EQ(child.combined(), root.id() + "." + child.id());
-  EXPECT_EQ(grandchild.combined(), root.id() + "." + child.id() + "." + grandchild.id());
-}
-
-TEST_F(Family, StatesComeFromTheParent) {
-  struct Row {
-    std::int32_t mine;
-    const char* name;
-    std::int32_t expected;
-    double threshold;
-  };
-  join(0, false, kBackendDisabled, 0.25);
-  for (const Row& row : {Row{kBackendReporting, "httppost", kBackendDisabled, 0.25},
-                         Row{kBackendHeld, "httppost", kBackendHeld, 0.75},
-                         Row{kBackendReporting, "httppost2", kBackendDisabled, 0.75}}) {
-    const Member child = join(1, false, row.mine, 0.75, row.name);
-    EXPECT_EQ(child.backend->state(), row.expected) << row.name;
-    EXPECT_EQ(child.backend->samplingThreshold(), row.threshold) << row.name;
-  }
-  const Member orphan = join(5);
-  EXPECT_EQ(orphan.backend->state(), kBackendReporting);
-  EXPECT_EQ(log.count(RecordedLog::Level::info,
-                      "child session 5 (backend httppost) with hierarchy 5 is missing its parent"),
-            1);
-}
-
-TEST_F(Family, TheTopmostAggregatorGetsEveryCopy) {
-  const Member child = join(1, true);
-  const Member grandchild = join(2, true);
-  EXPECT_FALSE(grandchild.session->hasAggregator());  // the child aggregates above it
-  const Member root = join(0, true);
-  EXPECT_FALSE(child.session->hasAggregator());
-  EXPECT_TRUE(root.session->hasAggregator());
-  root.connection->copies.clear();
-  child.connection->copies.clear();
-  for (std::uint16_t type = 10; type < 13; ++type) {
-    send(child, type);
-    send(grandchild, type);
-  }
-  ASSERT_EQ(root.connection->copies.size(), 6u);
-  EXPECT_EQ(root.connection->copies[4].type, 12);
-  EXPECT_EQ(root.connection->copies[4].sessionInfo->int32("sessionID"), 1);
-  EXPECT_EQ(*root.connection->copies[4].payload->string("serviceName"), "BETA");
-  EXPECT_TRUE(child.connection->copies.empty());
-  root.connection->gone = true;
-  log.expectLine(RecordedLog::Level::error, "Failed to get remote object proxy: the client has gone");
-  send(child, 20);
-  EXPECT_EQ(child.backend->messages.back().respCode, 20);
-  root.connection->gone = false;
 }
 
 }  // namespace

@@ -351,7 +351,8 @@ class Hostile(HTTPSTest):
     def test_texts_break_nothing(self):
         self.serve(entry(client=None, custom_clientId=1))
         payload = {f"key{n} {text[:30]}": text for n, text in enumerate(self.TEXTS)}
-        payload.update(at=datetime.datetime(2014, 11, 16, 20, 13, 54), list=[["a\nb"]], more={"a\n": "b"}, raw=b"\0")
+        payload.update(at=datetime.datetime(2014, 11, 16, 20, 13, 54), list=[["a\nb"]], more={"a\n": "b"}, raw=b"\0",
+                       nan=float("nan"))
         with self.serving("Quillfen unable to handle key: ") as daemon:
             for name in (text for text in self.TEXTS if len(text) < 1000):
                 client = self.client(name, user_info={"service\nName": name, "serviceName": name[::-1]})
@@ -361,7 +362,7 @@ class Hostile(HTTPSTest):
                         self.assertEqual(event[key], text, key[:50])
                 self.assertEqual([event[key] for key in ("at", "clientName", "serviceName")],
                                  [1416168834, name, name[::-1]])
-                self.assertFalse({"list", "more", "raw"} & set(event))
+                self.assertFalse({"list", "more", "raw", "nan"} & set(event))
                 client.message(9, 9, **{"list\n<3>faked": [1]})
                 client.close()
             posts = self.posts("phone", 4 * (len(self.TEXTS) - 1))
@@ -373,7 +374,7 @@ class Hostile(HTTPSTest):
             name = post["body"]["events"][0]["clientName"]
             sent = "".join(c for c in name if c >= " " and c != "\x7f").strip(" ")
             self.assertEqual(post["headers"].get("X-VLT-Client-Name", ""), sent)
-        self.assertEqual(self.counts()["event field removed: JSON cannot carry it"], 4 * (len(self.TEXTS) - 1))
+        self.assertEqual(self.counts()["event field removed: JSON cannot carry it"], 5 * (len(self.TEXTS) - 1))
         self.assertEqual(len({post["body"]["clientId"] for post in posts}), len(self.TEXTS) - 1)
         for log in (self.root.path / LOGS).iterdir():
             entries = [line for line in log.read_text().split("\n") if "[httppost -> " in line]
