@@ -64,12 +64,16 @@ std::optional<ipc::ServiceSocket> openSocket(platform::Services& services) {
   return std::move(socket).value();
 }
 
-void serve(platform::Services& services, platform::RunLoop& loop) {
+void serve(platform::Services& services, VeltradAgent& agent, platform::RunLoop& loop) {
   const double started = platform::timevalToSeconds(services.clock.now());
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
+  bool used = false;
   loop.run(tick, [&] {
     services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
+    const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
+    if (used && idle) platform::returnFreeMemory();
+    used = !idle;
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
   });
 }
@@ -109,7 +113,7 @@ int main() {
   if (!listener.resume()) return 1;
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, loop);
+  serve(services, daemon.agent(), loop);
 
   const std::size_t stuck = stop(services, listener);
   if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited

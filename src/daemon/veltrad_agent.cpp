@@ -97,6 +97,11 @@ std::optional<std::string> VeltradAgent::storebagVersionForSession(const Veltrad
   return _cachedStorebags.versionForClientType(session.clientType().value_or(0));
 }
 
+void VeltradAgent::changeIdentity(const std::function<void()>& change) {
+  const Lock held(_lock);
+  change();
+}
+
 void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) {
   const SharedDictionary userInfo = session->userInfo();
   if (!userInfo) {

@@ -32,6 +32,7 @@ class VeltradAgent final : public ListenerDelegate, public VeltradSessionDelegat
 
   std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const VeltradSession& session) override;
+  void changeIdentity(const std::function<void()>& change) override;
   void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) override;
   std::optional<std::string> parentSessionIDStringForSession(const VeltradSession& session) override;
   std::shared_ptr<VeltradSession> parentSessionForChild(const VeltradSession& session) override;

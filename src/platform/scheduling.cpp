@@ -29,6 +29,10 @@ void shareHeaps() {
   mallopt(M_ARENA_MAX, 2);
 }
 
+void returnFreeMemory() {
+  malloc_trim(0);
+}
+
 void raiseDescriptorLimit() {
   struct rlimit limit {};
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0 || limit.rlim_cur == limit.rlim_max) return;

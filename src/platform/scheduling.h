@@ -9,6 +9,8 @@ namespace veltrad::platform {
 void takeUtilitySchedulingClass();
 // Two heaps for all threads instead of eight a core: a daemon of many small threads keeps its memory small.
 void shareHeaps();
+// What the heaps keep for later goes back to the system; costs a walk over them.
+void returnFreeMemory();
 // The soft limit on descriptors up to the hard one.
 void raiseDescriptorLimit();
 

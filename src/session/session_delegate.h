@@ -21,6 +21,9 @@ class VeltradSessionDelegate {
   virtual std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession& session) = 0;
   // Never downloads.
   virtual std::optional<std::string> storebagVersionForSession(const VeltradSession& session) = 0;
+  // Runs `change` under the registry's lock: a session that changes its user info and joins another list in
+  // it is never seen between two.
+  virtual void changeIdentity(const std::function<void()>& change) = 0;
   // The session joins the list of its user-info key, leaving any other.
   virtual void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) = 0;
   // The ID strings of the session's ancestors from the root to its parent, joined by "."; from the gap on

@@ -151,10 +151,13 @@ void VeltradSession::sendStartMessage() {
 }
 
 void VeltradSession::updateSessionWithDefaultSessionInfo() {
-  const auto self = shared_from_this();
-  _sessionDelegate.userInfoUpdatedForSession(self);
+  _sessionDelegate.userInfoUpdatedForSession(shared_from_this());
+  refreshStates();
+}
+
+void VeltradSession::refreshStates() {
   updateReportingStates();
-  _sessionDelegate.updateDownstreamSessions(self);
+  _sessionDelegate.updateDownstreamSessions(shared_from_this());
 }
 
 void VeltradSession::updateReportingStates() {
@@ -191,14 +194,21 @@ void VeltradSession::receivedUserInfo(SharedDictionary updated) {
   }
   const bool unchanged = current && updated && sameName(*current, *updated, kVeltraUserInfoClientName) &&
                          sameName(*current, *updated, kVeltraUserInfoServiceName);
-  {
-    const Lock held(_mutex);
-    _userInfo = std::move(updated);
-  }
-  updateUserInfoForBackends();
-  if (unchanged) return;
-  logDebug("receivedUserInfo: Received new user info for session %u", sessionID());
-  updateSessionWithDefaultSessionInfo();
+  const auto take = [this, &updated] {
+    {
+      const Lock held(_mutex);
+      _userInfo = std::move(updated);
+    }
+    updateUserInfoForBackends();
+  };
+  if (unchanged) return take();
+  const auto self = shared_from_this();
+  _sessionDelegate.changeIdentity([&] {
+    take();
+    logDebug("receivedUserInfo: Received new user info for session %u", sessionID());
+    _sessionDelegate.userInfoUpdatedForSession(self);
+  });
+  refreshStates();
 }
 
 void VeltradSession::fetchDisplayURL(StringReply reply) {

@@ -100,6 +100,7 @@ class VeltradSession final : public ClientSessionInterface,
   void updateReportingStates();
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
+  void refreshStates();
   void receivedUserInfo(SharedDictionary userInfo);
   // Through the checks to the aggregating client and every backend; the answer for the client, or none.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,

@@ -25,6 +25,7 @@ struct Lines final : MessageLog {
 struct Delegate final : VeltradSessionDelegate {
   std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession&) override { return storebag; }
   std::optional<std::string> storebagVersionForSession(const VeltradSession&) override { return "1.5"; }
+  void changeIdentity(const std::function<void()>& change) override { change(); }
   void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>&) override { ++userInfoUpdates; }
   std::optional<std::string> parentSessionIDStringForSession(const VeltradSession&) override { return {}; }
   std::shared_ptr<VeltradSession> parentSessionForChild(const VeltradSession&) override { return nullptr; }
@@ -237,36 +238,6 @@ TEST_F(Session, TheEndSendsTheStopMessageAndCleansUp) {
   EXPECT_EQ(connection.use_count(), 1);
   backend->flush("after the end", std::nullopt);
   EXPECT_EQ(messageLog.lines.back(), "[httppost -> flushMessages] after the end");
-}
-
-TEST_F(Session, AOneShotMessageLeavesTheSessionsBackendsAlone) {
-  const auto oneShot = [this](OptionalDictionary info) {
-    std::optional<std::string> given = "(no reply)";
-    session->sendMessageWithSessionInfo(
-        std::move(info), Dictionary{{"clientName", "phone"}, {"serviceName", "ringer"}}, 5, 1,
-        Dictionary{{"n", 1}}, [&given](auto text) { given = std::move(text); });
-    return given;
-  };
-  const Dictionary info{{"clientType", 7}, {"sessionID", 9}, {"requireUserInfo", true}};
-  log.expectLine(RecordedLog::Level::error,
-                 "sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
-  EXPECT_EQ(oneShot(Dictionary{{"clientType", 7}}), "(no reply)");
-  EXPECT_EQ(oneShot(info), "storebag not available");
-  delegate.storebag = std::make_shared<const Dictionary>(
-      Dictionary{{"ampery", profile("a", kBackendDisabled)}, {"httppost", profile("h")}, {"unknown", 1}});
-  EXPECT_EQ(oneShot(info), "finished");
-  for (const char* name : {"ampery", "httppost"}) {
-    const auto& backend = *backends.last[name];
-    ASSERT_EQ(backend.messages.size(), 1u);
-    EXPECT_EQ(backend.messages[0].flag, 0);
-    EXPECT_EQ(backend.updates, 1);
-    EXPECT_TRUE(backend.cleaned);
-    EXPECT_EQ(backend.flushes, 0);
-  }
-  EXPECT_EQ(messageLog.lines.back(), "[httppost -> sendMessageWithSessionInfo] h");
-  EXPECT_EQ(session->sessionID(), 9u);
-  EXPECT_EQ(delegate.userInfoUpdates, 1);
-  EXPECT_EQ(send(message()), std::nullopt);  // still without back ends of its own
 }
 
 TEST_F(Session, AnInternalReleaseReportsTheWholeDevice) {
