@@ -6,7 +6,6 @@
 
 #include <climits>
 
-#include "config/client_types.h"
 #include "config/storebag_container.h"
 #include "config/storebag_section.h"
 #include "configuration.h"
@@ -145,26 +144,6 @@ TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
   for (int depth = 1; depth < kStorebagBagLimits.depth; ++depth) bag = Dictionary{{"deeper", bag}};
   EXPECT_EQ(parseStorebagBag(writeBinaryPropertyList(bag)), bag);
   EXPECT_FALSE(parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
-}
-
-std::string all(const char* (*nameOf)(std::int32_t)) {
-  std::string names;
-  for (int index = -1; index <= kVeltraClientTypeCount; ++index) {
-    const char* name = nameOf(index);
-    names += std::string(name != nullptr ? name : "-") + ' ';
-  }
-  EXPECT_EQ(nameOf(INT_MIN), nullptr);
-  EXPECT_EQ(nameOf(INT_MAX), nullptr);
-  return names;
-}
-
-TEST(ClientTypes, HaveTheNamesThatServersKnow) {
-  EXPECT_EQ(
-      all(storebagNameForClientType),
-      "- - - - - - pellmarch ostvane quindle brevatto sollwick tamberlin quindle crovish quindle ostvane "
-      "ostvane melkard yarrowin - ");
-  EXPECT_EQ(all(senderCodeForComponentType),
-            "- PV DR XLN BQ HW ZE FU JY KO WA UT EB MYRT QOLIN FU-GLP FU-TOLMS GARNOVE LIMBET - ");
 }
 
 struct Choice {

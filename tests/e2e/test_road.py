@@ -8,6 +8,7 @@ from harness import IDENTITY, SOURCE, SystemTest, Wire, program, wait_until
 
 class Road(SystemTest):
     def test_event_with_its_headers_and_fields(self):
+        self.root.write("usr/share/veltra/package.plist", {"version": "8.2"})
         with self.serving() as daemon:
             session, backends = self.open()
             self.assertEqual(backends, ["httppost"])
@@ -22,7 +23,7 @@ class Road(SystemTest):
         self.assertEqual((stop["_method"], stop["_status"], stop["StorebagVersion"], stop["Opt"]), (0, 1, "v1", 0))
         expected = {"codec": "opus", "seconds": 12.5, "tags": 3, "_sender": "JY", "_clientVersion": 3,
                     "_eventNumber": 2, "_method": 5, "_status": 2, "_productFamily": "Elm", "_productModel": "Elm4,2",
-                    "_osVersion": "12.1", "_build": "21B74", "_internal": 3, "_reportVers": "8.0",
+                    "_osVersion": "12.1", "_build": "21B74", "_internal": 3, "_reportVers": "8.2",
                     "_timezoneOffset": 0, "clientName": "phone", "serviceName": "ringer"}
         self.assertEqual({key: event[key] for key in expected}, expected)
         self.assertEqual(set(event) - set(expected), {"_startTS", "_sessionID", "_clientTS", "eventTime"})
@@ -36,7 +37,7 @@ class Road(SystemTest):
         self.assertAlmostEqual(post["body"]["postTime"], time.time(), delta=120)
         self.assertEqual(len(post["body"]["clientId"]), 36)
         headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer",
-                   "User-Agent": "Veltra/8.0 (Elm4,2; 12.1)",
+                   "User-Agent": "Veltra/8.2 (Elm4,2; 12.1)",
                    "X-VLT-Client-Version": "3", "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2",
                    "Accept": "application/json", "Content-Type": "application/json",
                    "Content-Length": str(post["bytes"])}
@@ -136,8 +137,9 @@ class Ctl(SystemTest):
     def test_single_calls(self):
         with self.serving() as daemon:
             identity = ["--client-type", "7", "--client", "phone", "--require-user-info"]
-            self.ctl("send", *identity, "--category", "9", "--type", "4", "codec=opus")
+            self.ctl("send", *identity, "--category", "9", "--type", "4", "--flag", "1", "codec=opus")
             self.lab.wait_for_events(1, _method=9, _status=4, codec="opus")
+            self.assertIn("/realtime", [post["path"] for post in self.lab.received("events")])
             for command, answer in (("states", "httppost"), ("display-url", "https://display.example/phone")):
                 self.assertIn(answer, self.ctl(command, *identity)[0])
             for wrong in (["dance"], ["send", *identity, "--category", "70000"]):

@@ -44,28 +44,6 @@ TEST(Options, sessionSaysWhoTheClientIs) {
             Dictionary({{"clientName", "123"}, {"serviceName", "ringer"}, {"build", 7}, {"region", "EU"}}));
 }
 
-TEST(Options, otherCommandsTakeTheirs) {
-  const Options send = parsed<Options>(
-      "send --category 65535 codec=opus --type 0 --flag 3 --user-info region=EU seconds=12.5 "
-      "--client-type=7");
-  EXPECT_EQ(send.category, 65535);
-  EXPECT_EQ(send.type, 0);
-  EXPECT_EQ(send.flag, 3u);
-  EXPECT_EQ(send.payload, Dictionary({{"codec", "opus"}, {"seconds", 12.5}}));
-  EXPECT_EQ(send.identity.userInfo, Dictionary({{"region", "EU"}}));
-  EXPECT_EQ(parsed<Options>("upload-log-data --user-info a=1 logs.json").file, "logs.json");
-  const Options oneShot =
-      parsed<Options>("one-shot --category 5 --type 1 codec=opus --user-info a=1 b=2 --session-id 42");
-  EXPECT_EQ(oneShot.payload, Dictionary({{"codec", "opus"}, {"b", 2}}));
-  EXPECT_EQ(oneShot.identity.userInfo, Dictionary({{"a", 1}}));
-  for (const char* line : {"--json --root there stats", "stats --json --root there"}) {
-    const Options stats = parsed<Options>(line);
-    EXPECT_EQ(stats.command, Command::stats);
-    EXPECT_TRUE(stats.json);
-    EXPECT_EQ(stats.root, "there");
-  }
-}
-
 TEST(Options, wrongUsageSaysWhatWasExpected) {
   const std::pair<const char*, const char*> cases[] = {
       {"",
