@@ -1,21 +1,14 @@
-"""Publishes examples/storebag.json, plays examples/call.jsonl and examples/lamp.jsonl against a lab and a daemon in a
-temporary root, and shows both ends of the road. Status 0: what was to arrive did, and nothing else."""
+"""One call: publishes examples/storebag.json, plays examples/call.jsonl and examples/lamp.jsonl, and shows both ends of the
+road."""
 import collections
 import contextlib
 import json
 import re
-import shlex
-import signal
 import subprocess
 import sys
-import threading
-from pathlib import Path
 
-SOURCE = Path(__file__).resolve().parent.parent
-sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
-from harness import Daemon, Lab, Root, program, wait_until  # noqa: E402
+from stage import EXAMPLES, heading, program, wait_until
 
-EXAMPLES = SOURCE / "examples"
 PHONE = ["session", "--client-type", "6", "--session-id", "42", "--client-version", "3", "--client", "phone",
          "--service", "ringer", "--user-info", "line=2", "--require-user-info", "--batch-events"]
 LAMP = ["session", "--client-type", "6", "--session-id", "43", "--client", "lamp", "--service", "hall",
@@ -31,10 +24,6 @@ def messages(name):
 
 def kind(event):
     return event["_method"], event["_status"]
-
-
-def heading(text):
-    print(f"\n\033[1m{text}\033[0m" if sys.stdout.isatty() else f"\n{text}", flush=True)
 
 
 def posted(reply):
@@ -90,16 +79,6 @@ def show_message_log(root):
             print(f"  {first} … and {len(rest)} lines")
 
 
-def show_stats(root):
-    taken = messages("call.jsonl").total() + messages("lamp.jsonl").total()
-
-    def stats():
-        done = subprocess.run([program("veltractl"), "--root", str(root.path), "stats"], capture_output=True, text=True)
-        return done.stdout if f"{taken}  message taken in" in done.stdout else None
-    heading("veltractl stats")
-    print("  " + wait_until(stats, f"{taken} messages counted").replace("\n", "\n  ").rstrip())
-
-
 def check(posts):
     """What is wrong with what arrived."""
     events = [event for post in posts for event in post["body"]["events"]]
@@ -114,24 +93,14 @@ def check(posts):
     return problems
 
 
-def stay(root, lab):
-    control = shlex.join([program("veltractl"), "--root", str(root.path)])
-    heading("Up until Ctrl-C. In another terminal, try:")
-    print(f"  {control} {shlex.join(PHONE)}")
-    print("""    and then lines such as {"op":"send","category":5,"type":10,"payload":{"codec":"opus"}}""")
-    print(f"  {control} send --client-type 6 --client phone --service ringer --require-user-info "
-          "--category 5 --type 10 codec=opus seconds=12.5")
-    print(f"  {control} stats")
-    print(f"  VELTRA_ROOT={root.path} {program('hello')}")
-    print(f"  open {lab.url}/ in a browser: what arrives, live (the certificate is the lab's own)")
-    print(f"  edit {lab.path}/storebags/ostvane.json: what the daemon is told (signed at each request)", flush=True)
-    stopped = threading.Event()
-    for number in (signal.SIGINT, signal.SIGTERM):
-        signal.signal(number, lambda *_: stopped.set())
-    stopped.wait()
+def taken():
+    """How many messages the daemon takes in."""
+    return messages("call.jsonl").total() + messages("lamp.jsonl").total()
 
 
 def show(root, lab, daemon):
+    """What went wrong."""
+    (lab.path / "storebags/ostvane.json").write_bytes((EXAMPLES / "storebag.json").read_bytes())
     print("playing examples/call.jsonl, then examples/lamp.jsonl, through veltractl session", file=sys.stderr)
     answers = play(root, "call.jsonl", PHONE)
     lamp = play(root, "lamp.jsonl", LAMP)
@@ -146,37 +115,9 @@ def show(root, lab, daemon):
     posts = lab.received("events")
     show_posts(posts)
     show_message_log(root)
-    show_stats(root)
     problems = check(posts)
     if json.loads(lamp.splitlines()[0])["backends"] != []:
         problems.append("the lamp was told that something reports")
-    heading("\n".join(problems) or f"{expected} of {expected} events arrived, none of the lamp's")
-    return 1 if problems else 0
-
-
-def main():
-    root = Root()
-    print(f"starting the lab and the daemon; this run's root is {root.path}", file=sys.stderr)
-    lab = Lab()
-    try:
-        root.use(lab)
-        (lab.path / "storebags/ostvane.json").write_bytes((EXAMPLES / "storebag.json").read_bytes())
-        daemon = Daemon(root)
-        try:
-            status = show(root, lab, daemon)
-            if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
-                daemon.allow("<")  # whatever is tried
-                stay(root, lab)
-        finally:
-            daemon.stop()
-        return status
-    except AssertionError as fault:
-        print(f"scripts/run: {fault}", file=sys.stderr)
-        return 1
-    finally:
-        lab.stop()
-        Lab.forget_keys()
-        root.remove()
-
-
-sys.exit(main())
+    if not problems:
+        heading(f"{expected} of {expected} events arrived, none of the lamp's")
+    return problems

@@ -1,0 +1,69 @@
+"""Starts a lab and a daemon in a temporary root and plays one act after another. Status 0: what was to arrive did, and
+nothing else."""
+import shlex
+import signal
+import subprocess
+import sys
+import threading
+
+import call
+import family
+from stage import Daemon, Lab, Root, heading, program, wait_until
+
+ACTS = (call, family)
+
+
+def show_stats(root):
+    taken = sum(act.taken() for act in ACTS)
+
+    def stats():
+        done = subprocess.run([program("veltractl"), "--root", str(root.path), "stats"], capture_output=True, text=True)
+        return done.stdout if f"{taken}  message taken in" in done.stdout else None
+    heading("veltractl stats")
+    print("  " + wait_until(stats, f"{taken} messages counted").replace("\n", "\n  ").rstrip())
+
+
+def stay(root, lab):
+    control = shlex.join([program("veltractl"), "--root", str(root.path)])
+    heading("Up until Ctrl-C. In another terminal, try:")
+    print(f"  {control} {shlex.join(call.PHONE)}")
+    print("""    and then lines such as {"op":"send","category":5,"type":10,"payload":{"codec":"opus"}}""")
+    print(f"  {control} send --client-type 6 --client phone --service ringer --require-user-info "
+          "--category 5 --type 10 codec=opus seconds=12.5")
+    print(f"  {control} stats")
+    print(f"  VELTRA_ROOT={root.path} {program('hello')}")
+    print(f"  open {lab.url}/ in a browser: what arrives, live (the certificate is the lab's own)")
+    print(f"  edit {lab.path}/storebags/ostvane.json: what the daemon is told (signed at each request)", flush=True)
+    stopped = threading.Event()
+    for number in (signal.SIGINT, signal.SIGTERM):
+        signal.signal(number, lambda *_: stopped.set())
+    stopped.wait()
+
+
+def main():
+    root = Root()
+    print(f"starting the lab and the daemon; this run's root is {root.path}", file=sys.stderr)
+    lab = Lab()
+    try:
+        root.use(lab)
+        daemon = Daemon(root)
+        try:
+            problems = [problem for act in ACTS for problem in act.show(root, lab, daemon)]
+            show_stats(root)
+            heading("\n".join(problems) or "All that was to arrive did, and nothing else.")
+            if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
+                daemon.allow("<")  # whatever is tried
+                stay(root, lab)
+        finally:
+            daemon.stop()
+        return 1 if problems else 0
+    except AssertionError as fault:
+        print(f"scripts/run: {fault}", file=sys.stderr)
+        return 1
+    finally:
+        lab.stop()
+        Lab.forget_keys()
+        root.remove()
+
+
+sys.exit(main())
