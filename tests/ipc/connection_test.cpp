@@ -3,8 +3,6 @@
 #include <poll.h>
 #include <sys/resource.h>
 
-#include <atomic>
-
 #include "harness.h"
 
 namespace veltrad::ipc_test {
@@ -117,44 +115,6 @@ struct GatedDoor : Door {
   }
   Gate gate;
 };
-
-TEST(Events, ReachTheClientOrFailWithAReason) {
-  Door door;
-  WireEnd client = door.client();
-  std::vector<std::string> failures;
-  const auto remote = door.remote([&](const std::string& why) { failures.push_back(why); });
-  remote->sendMessageToClient({}, 0, 0, 0, Dictionary{{"long", std::string(1'200'000, 'x')}});
-  remote->sendMessageToClient({}, 1.5, 65535, 2, {});
-  EXPECT_EQ(client.next().args(), (Dictionary{{"category", 65535}, {"timestamp", 1.5}, {"type", 2}}));
-  client.close();
-  ASSERT_TRUE(door.journal.waitFor("end"));
-  remote->sendMessageToClient({}, 0, 0, 0, {});
-  EXPECT_THAT(failures, ElementsAre(HasSubstr("is larger than a frame may be"), "The client has gone."));
-}
-
-TEST(Events, ToAClientThatDoesNotReadAreBoundedAndCounted) {
-  Door door;
-  WireEnd client = door.client();
-  std::atomic<unsigned> failed{0};
-  const auto remote = door.remote([&](const std::string&) { ++failed; });
-  constexpr unsigned kSent = 10'000;
-  const auto send = [&] {
-    for (unsigned n = 0; n < kSent / 2; ++n)
-      remote->sendMessageToClient({}, 1, 1, 1, Dictionary{{"text", std::string(1000, 'x')}});
-  };
-  std::thread another(send);
-  send();
-  another.join();
-  EXPECT_GT(failed.load(), kSent / 2);
-  EXPECT_EQ(door.counters.value("event dropped: the client does not read"), failed.load());
-  // What was not dropped is all there, whole, and the connection goes on.
-  client.send(messageFrame(5));
-  unsigned events = 0;
-  Received frame = client.next();
-  for (; frame.kind == FrameKind::event; frame = client.next()) ++events;
-  EXPECT_EQ(frame.callID, 5u);
-  EXPECT_EQ(events + failed.load(), kSent);
-}
 
 TEST(Replies, FromElsewhereThatNobodyReadsEndTheConnection) {
   Door door;

@@ -126,10 +126,6 @@ class Door : public ListenerDelegate {
     connection->setExportedObject(std::make_shared<RecordingSession>(journal, onMessage));
     connection->setInterruptionHandler([this] { journal.add("interrupted"); });
     connection->setInvalidationHandler([this] { journal.add("invalidated"); });
-    {
-      std::lock_guard lock(_mutex);
-      _latest = connection;
-    }
     connection->resume();
     return true;
   }
@@ -142,11 +138,6 @@ class Door : public ListenerDelegate {
     EXPECT_EQ(writeJSON(client.next().body), R"({"daemon":"8.0","wire":1})");
     return client;
   }
-  // The client's object of the latest connection.
-  std::shared_ptr<ClientSessionReplyInterface> remote(std::function<void(const std::string&)> failed) {
-    std::lock_guard lock(_mutex);
-    return _latest.lock()->remoteObjectProxyWithErrorHandler(std::move(failed));
-  }
   std::size_t stop(std::chrono::milliseconds time = kPatience) { return _listener->invalidate(within(time)); }
 
   const TemporaryRoot root;
@@ -158,8 +149,6 @@ class Door : public ListenerDelegate {
  private:
   FakeFileStore _files;
   platform::Entitlements _entitlements;
-  std::mutex _mutex;
-  std::weak_ptr<Connection> _latest;
   std::unique_ptr<Listener> _listener;
 };
 
