@@ -351,10 +351,11 @@ std::optional<std::string> Server::start(int port, int dashboardPort) {
     port = -1;
   if (port < 0) return "the port is taken or may not be bound; --port 0 takes any free one";
   _url = "https://localhost:" + std::to_string(port);
+  if (auto failure = _dashboard.start(dashboardPort)) return failure;  // first: requests ask for its port
   _library->accepting = std::thread([this] { _library->failed = !_library->http.listen_after_bind(); });
   while (!http.is_running() && !_library->failed) std::this_thread::sleep_for(std::chrono::milliseconds(1));
   if (_library->failed) return "the server could not accept connections";
-  return _dashboard.start(dashboardPort);
+  return std::nullopt;
 }
 
 void Server::stop() {
