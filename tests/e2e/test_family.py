@@ -1,4 +1,5 @@
 """Sessions of one identity: combined IDs, states from the parent, copies to the one client that aggregates."""
+import concurrent.futures
 import time
 
 from harness import Wire, storebag, wait_until
@@ -65,15 +66,20 @@ class Family(HTTPSTest):
             self.assertEqual(child.copies_now(), [END])  # an ancestor aggregates: this one's copies end
             grandchild = self.join(GRANDCHILD, name="Phone")
             root.copies_now()
-            for number in range(3):
-                for member in (root, child, grandchild):
+            members, sent = (root, child, grandchild), 100
+
+            def send(member):
+                for number in range(sent):
                     member.message(number=number)
+            with concurrent.futures.ThreadPoolExecutor() as at_once:
+                list(at_once.map(send, members))
             copies = root.copies_now()
-            self.assertEqual([(copy["sessionInfo"]["sessionID"], copy["payload"]["number"]) for copy in copies],
-                             [(member.number, number) for number in range(3) for member in (root, child, grandchild)])
-            self.assertEqual(copies[1]["payload"], {"number": 0, "clientName": "PHONE", "serviceName": "Ringer"})
-            self.assertEqual((child.copies_now(), grandchild.copies_now()), ([], []))
-            ids = [self.ids(level, 4).split(".") for level in range(3)]
+            for member in members:
+                mine = [copy["payload"] for copy in copies if copy["sessionInfo"]["sessionID"] == member.number]
+                self.assertEqual([payload["number"] for payload in mine], list(range(sent)))
+                self.assertEqual(mine[0]["clientName"], {child: "PHONE", grandchild: "Phone"}.get(member, "phone"))
+            self.assertEqual((len(copies), child.copies_now(), grandchild.copies_now()), (3 * sent, [], []))
+            ids = [self.ids(level, 1 + sent).split(".") for level in range(3)]
             self.assertEqual([len(each) for each in ids], [1, 2, 3])
             self.assertEqual((ids[2][:2], ids[1][:1]), (ids[1], ids[0]))
             # An equal number: the first that came stays the root, and a stranger belongs to no family.
