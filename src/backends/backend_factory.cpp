@@ -1,22 +1,42 @@
 // The names of the backends and the kinds behind them.
 #include "backends/backend_factory.h"
 
+#include "backends/ampery/ampery_backend.h"
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/https/https_post_backend.h"
+#include "backends/mivo/mivo_backend.h"
+#include "backends/upload/upload_backend.h"
 #include "platform/log.h"
 #include "protocol/constants.h"
+#include "support/device_identity.h"
 
 namespace veltrad {
 
+namespace {
+// A device of this product type has no adaptor.
+constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+}  // namespace
+
 std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
-    std::int32_t) {
+    std::int32_t clientType) {
   if (name == kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName(_services, _uploads, name, profile.asDictionary(),
+    return DashboardBackend::initWithName(_services, _logData, name, profile.asDictionary(),
                                           productFamily.value_or(""));
+  }
+  if (name == kVeltraBackendUploadServer) {
+    return UploadBackend::initWithName(_services, _files, name, profile.asDictionary(),
+                                       productFamily.value_or(""));
   }
   if (name == kVeltraBackendHTTPPost || name == kVeltraBackendHTTPPost2) {
     return HTTPSPostBackend::initWithName(_services, name, profile.asDictionary(), productFamily);
+  }
+  if (name == kVeltraBackendAmpery) {
+    return AmperyBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""));
+  }
+  if (name == kVeltraBackendMivo && _services.device.deviceProductType() != kProductTypeWithoutMivo) {
+    return MivoBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""),
+                                     clientType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -7,6 +7,7 @@
 
 #include "backends/backend.h"
 #include "backends/dashboard/log_data_uploads.h"
+#include "backends/upload/file_uploads.h"
 
 namespace veltrad {
 
@@ -15,8 +16,11 @@ class ProcessSettings;
 class Veltra;
 namespace platform {
 class Clock;
+class CodeBundle;
 class Counters;
+class EnergyLog;
 class HTTPClient;
+class LentFiles;
 class Locale;
 class Preferences;
 class WorkPool;
@@ -30,10 +34,13 @@ struct BackendServices {
   platform::Locale& locale;
   platform::Preferences& preferences;
   platform::Counters& counters;
+  platform::EnergyLog& energyLog;
+  platform::CodeBundle& adaptorBundle;
   ProcessSettings& settings;
   DeviceIdentity& device;
   const Veltra& library;
   platform::WorkPool& pool;
+  platform::LentFiles& lentFiles;
 };
 
 class BackendFactory {
@@ -47,14 +54,15 @@ class BackendFactory {
 
 class StandardBackendFactory final : public BackendFactory {
  public:
-  explicit StandardBackendFactory(BackendServices services) : _services(services), _uploads(services.http) {}
+  explicit StandardBackendFactory(BackendServices services) : _services(services), _logData(services.http) {}
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType) override;
 
  private:
   const BackendServices _services;
-  LogDataUploads _uploads;
+  LogDataUploads _logData;
+  FileUploads _files;
 };
 
 }  // namespace veltrad

@@ -140,6 +140,22 @@ bool containsIgnoringCase(std::string_view text, std::string_view part) {
   return lowerCase(text).find(lowerCase(part)) != std::string::npos;
 }
 
+std::string percentEncoded(std::string_view text, std::string_view kept) {
+  constexpr std::string_view kDigits = "0123456789ABCDEF";
+  constexpr std::string_view kUnreserved =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~";
+  std::string encoded;
+  for (const char c : text) {
+    if (kUnreserved.find(c) != std::string_view::npos || kept.find(c) != std::string_view::npos) {
+      encoded += c;
+    } else {
+      const auto byte = static_cast<unsigned char>(c);
+      encoded += {'%', kDigits[byte >> 4], kDigits[byte & 15]};
+    }
+  }
+  return encoded;
+}
+
 std::string escapedForLog(std::string_view text) {
   std::string out;
   out.reserve(text.size());

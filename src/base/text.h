@@ -49,6 +49,9 @@ std::string lowerCase(std::string_view text);
 bool equalIgnoringCase(std::string_view a, std::string_view b);
 bool containsIgnoringCase(std::string_view text, std::string_view part);
 
+// Keeps letters, digits, "-._~" and what `kept` holds, all ASCII; each other byte becomes "%" and two digits.
+std::string percentEncoded(std::string_view text, std::string_view kept);
+
 // For one log line: valid UTF-8 stays; controls, DEL, C1 controls, U+2028, U+2029 and bytes that are no UTF-8
 // become \xNN for each byte; a backslash is doubled.
 std::string escapedForLog(std::string_view text);

@@ -107,9 +107,9 @@ int main() {
   if (!socket) return 1;
 
   Daemon daemon(services);
-  Listener listener(
-      {std::move(*socket), services.entitlements, services.counters, services.root.entitlementsPath()},
-      daemon.agent());
+  Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
+                     services.root.entitlementsPath()},
+                    daemon.agent());
   if (!listener.resume()) return 1;
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");

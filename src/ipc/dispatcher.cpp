@@ -18,6 +18,7 @@ constexpr PropertyListLimits kLargeCallLimits{kLargeFrameBodyLimit, 64, 500'000,
 struct Call {
   ClientSessionInterface& session;
   const Dictionary& arguments;
+  const std::string& extensionToken;
   std::shared_ptr<PendingReply> pending;  // null: no reply is wanted
 };
 
@@ -89,7 +90,7 @@ Refusal finishSession(Call& call) {
 Refusal uploadFile(Call& call) {
   const std::string* path = call.arguments.string("path");
   if (!path) return mustBe("path", "a text");
-  call.session.uploadFileAtPath(*path, {}, uploadedReply(std::move(call.pending)));
+  call.session.uploadFileAtPath(*path, call.extensionToken, uploadedReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -157,7 +158,7 @@ Result<Value, std::string> decodeFrameBody(const Frame& frame) {
 
 namespace {
 
-Refusal runCall(const Frame& frame, ClientSessionInterface& session,
+Refusal runCall(const Frame& frame, ClientSessionInterface& session, const std::string& extensionToken,
                 const std::shared_ptr<PendingReply>& pending) {
   const FrameKind kind = frame.header.kind;
   if (kind != FrameKind::call && kind != FrameKind::largeCall) {
@@ -177,17 +178,18 @@ Refusal runCall(const Frame& frame, ClientSessionInterface& session,
   }
   static const Dictionary kNone;
   const Dictionary* arguments = body.dictionary("args");
-  Call call{session, arguments ? *arguments : kNone, pending};
+  Call call{session, arguments ? *arguments : kNone, extensionToken, pending};
   return operation->run(call);
 }
 
 }  // namespace
 
 std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
-                                        const std::shared_ptr<OutQueue>& out) {
+                                        const std::shared_ptr<OutQueue>& out,
+                                        const std::string& extensionToken) {
   std::shared_ptr<PendingReply> pending;
   if (frame.header.callID != 0) pending = std::make_shared<PendingReply>(out, frame.header.callID);
-  Refusal refusal = runCall(frame, session, pending);
+  Refusal refusal = runCall(frame, session, extensionToken, pending);
   if (refusal && pending) {
     pending->fail(makeReportingError(fmt::format("The call cannot be read: {}.", toUTF8(*refusal)), -1));
   }

@@ -50,6 +50,7 @@ void refuseSocket(FileDescriptor socket, const std::string& description) {
 Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
     : _delegate(delegate),
       _entitlements(options.entitlements),
+      _lentFiles(options.lentFiles),
       _counters(options.counters),
       _entitlementsPath(std::move(options.entitlementsPath)),
       _mostConnections(options.mostConnections),
@@ -179,7 +180,7 @@ void Listener::admit(FileDescriptor socket) {
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
   auto connection = std::make_shared<ipc::SocketConnection>(
-      number, std::move(socket), std::move(peer.value()), _entitlements, _counters, _budget);
+      number, std::move(socket), std::move(peer.value()), _entitlements, _lentFiles, _counters, _budget);
   if (connection->usable() && startClient(number, uid, connection)) return;
   _counters.count("connection refused: no thread or descriptor is left");
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");

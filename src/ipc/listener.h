@@ -15,6 +15,7 @@
 #include "platform/counters.h"
 #include "platform/entitlements.h"
 #include "platform/file_descriptor.h"
+#include "platform/lent_files.h"
 #include "protocol/connection.h"
 
 namespace veltrad {
@@ -26,6 +27,7 @@ class SocketConnection;
 struct ListenerOptions {
   ServiceSocket socket;
   platform::Entitlements& entitlements;
+  platform::LentFiles& lentFiles;
   platform::Counters& counters;
   std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
   std::size_t mostConnections = 4096;
@@ -36,8 +38,9 @@ struct ListenerOptions {
 }  // namespace ipc
 
 // Job: every client that connects gets a Connection, on which the delegate decides on that connection's own
-// thread; a refused one gets a refusal frame that says why. The delegate, the entitlements and the counters
-// outlive it. resume() and invalidate() belong to the thread that made it, which is never a connection's own.
+// thread; a refused one gets a refusal frame that says why. The delegate, the entitlements, the lent files
+// and the counters outlive it. resume() and invalidate() belong to the thread that made it, which is never a
+// connection's own.
 class Listener {
  public:
   Listener(ipc::ListenerOptions options, ListenerDelegate& delegate);
@@ -80,6 +83,7 @@ class Listener {
   // Constant after construction.
   ListenerDelegate& _delegate;
   platform::Entitlements& _entitlements;
+  platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
   const std::string _entitlementsPath;
   const std::size_t _mostConnections;

@@ -35,4 +35,10 @@ void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, do
   }
 }
 
+void sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
+  Dictionary body{{"op", "removeUploadedFile:"}};
+  body.set("args", Dictionary{{"call", callID}});
+  out.sendEvent(makeFrame(FrameKind::event, 0, std::move(body)));
+}
+
 }  // namespace veltrad::ipc

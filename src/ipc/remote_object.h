@@ -26,4 +26,7 @@ class RemoteObject final : public ClientSessionReplyInterface {
   const ErrorHandler _handler;
 };
 
+// Asks the client to remove the file that it uploads with that call. No answer is awaited.
+void sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID);
+
 }  // namespace veltrad::ipc

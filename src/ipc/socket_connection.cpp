@@ -33,12 +33,13 @@ std::string refusalFrame(const std::string& description) {
 }
 
 SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                                   platform::Entitlements& entitlements, platform::Counters& counters,
-                                   ReadBudget& budget)
+                                   platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
+                                   platform::Counters& counters, ReadBudget& budget)
     : _out(std::make_shared<OutQueue>(std::move(socket), counters)),
       _peer(std::move(peer)),
       _description(describe(number, _peer)),
       _entitlements(entitlements),
+      _lentFiles(lentFiles),
       _counters(counters),
       _reader(budget) {}
 
@@ -155,8 +156,17 @@ bool SocketConnection::runFrame(const Frame& frame) {
     lent = std::move(*came);
   }
   if (!_greeted) return greet(frame);
-  if (const auto why = dispatchCall(frame, *_session, _out)) interrupted(*why);
+  if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
   return true;
+}
+
+// What came with the frame is lent for the call, whose reply follows a request to remove the file.
+std::optional<std::string> SocketConnection::runCall(const Frame& frame, platform::FileDescriptor lent) {
+  if (!lent.isOpen()) return dispatchCall(frame, *_session, _out);
+  const auto loan = _lentFiles.lend(std::move(lent), [out = _out, callID = frame.header.callID] {
+    if (callID != 0) sendRemoveUploadedFile(*out, callID);
+  });
+  return dispatchCall(frame, *_session, _out, loan.token());
 }
 
 bool SocketConnection::greet(const Frame& frame) {

@@ -11,6 +11,7 @@
 #include "ipc/socket_reader.h"
 #include "platform/counters.h"
 #include "platform/entitlements.h"
+#include "platform/lent_files.h"
 #include "platform/peer.h"
 #include "protocol/connection.h"
 
@@ -18,12 +19,13 @@ namespace veltrad::ipc {
 
 // Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
 // the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
-// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, counters and budget
-// outlive it. A session and its connection hold each other until run() returns.
+// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, lent files, counters and
+// budget outlive it. A session and its connection hold each other until run() returns.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
   SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                   platform::Entitlements& entitlements, platform::Counters& counters, ReadBudget& budget);
+                   platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
+                   platform::Counters& counters, ReadBudget& budget);
 
   // False: the system had no wake-up descriptor for it.
   bool usable() const { return _out->usable(); }
@@ -56,6 +58,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   void serve();
   bool runFrames();
   bool runFrame(const Frame& frame);
+  std::optional<std::string> runCall(const Frame& frame, platform::FileDescriptor lent);
   bool greet(const Frame& frame);
   bool receive();
   void waitForClientToRead();
@@ -72,6 +75,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   const platform::Peer _peer;
   const std::string _description;
   platform::Entitlements& _entitlements;
+  platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
 
   // Own thread only.

@@ -103,6 +103,10 @@ HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
   return answer->wait();
 }
 
+bool CurlHTTPClient::stopping() const {
+  return _impl->inbox.blockingFails();
+}
+
 void CurlHTTPClient::failBlockingWaits() {
   _impl->inbox.failBlocking();
   _impl->wake();

@@ -65,6 +65,8 @@ class HTTPClient {
   virtual void start(HTTPRequest request, HTTPCompletion completion) = 0;
   // Waits for the answer on the caller's thread; fails at once with `stopping` after failBlockingWaits().
   virtual HTTPResult perform(HTTPRequest request) = 0;
+  // perform() fails at once: work that leads to one can be given up.
+  virtual bool stopping() const { return false; }
 };
 
 struct HTTPClientSettings {
@@ -79,6 +81,7 @@ class CurlHTTPClient final : public HTTPClient {
   ~CurlHTTPClient() override;  // ends every transfer with `stopping`, then joins
   void start(HTTPRequest request, HTTPCompletion completion) override;
   HTTPResult perform(HTTPRequest request) override;
+  bool stopping() const override;
 
   // From now on perform() fails at once, those that wait included.
   void failBlockingWaits();

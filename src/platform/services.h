@@ -2,11 +2,14 @@
 #pragma once
 
 #include "platform/clock.h"
+#include "platform/code_bundle.h"
 #include "platform/counters.h"
 #include "platform/device_properties.h"
+#include "platform/energy_log.h"
 #include "platform/entitlements.h"
 #include "platform/file_store.h"
 #include "platform/http_client.h"
+#include "platform/lent_files.h"
 #include "platform/locale.h"
 #include "platform/preferences.h"
 #include "platform/random.h"
@@ -25,6 +28,8 @@ struct Services {
         locale(files, root.localeConfigurationPath()),
         entitlements(files, root.entitlementsPath()),
         transaction(serviceManager),
+        energyLog(clock, counters, root.energyLogPath()),
+        adaptorBundle(root.adaptorBundleDirectory(), "PellmarchPerformance"),
         http({root.extraCertificatesPath()}) {}
 
   const Root root;
@@ -38,8 +43,11 @@ struct Services {
   ServiceManager serviceManager;
   ServiceTransaction transaction;
   Counters counters;
+  EnergyLog energyLog;
+  CodeBundle adaptorBundle;
   CurlHTTPClient http;
   WorkPool pool;
+  LentFiles lentFiles;
 };
 
 }  // namespace veltrad::platform

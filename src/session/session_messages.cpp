@@ -1,5 +1,6 @@
 // A session's messages: routing to the aggregating client and the backends, flushes, uploads.
 #include "backends/backend.h"
+#include "base/text.h"
 #include "platform/counters.h"
 #include "platform/log.h"
 #include "protocol/connection.h"
@@ -186,6 +187,10 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
   } else {
     logError("uploadFileWithURL: File upload failed for %s", path.c_str());
   }
+  // The full text of the file's address.
+  _services.messageLog.writeToLogFile(
+      "[uploadFileWithURL] Upload %@ for file %@",
+      {uploaded ? "succeeded" : "failed", "file://" + percentEncoded(path, "/!$&'()*+,;=:@")});
   if (completionHandler) completionHandler(uploaded);
 }
 

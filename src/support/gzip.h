@@ -1,6 +1,8 @@
 // Compression of whole buffers with zlib's deflate. Pure functions but for their log lines; any thread.
 #pragma once
 
+#include <cstddef>
+#include <functional>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -9,6 +11,13 @@ namespace veltrad {
 
 // The gzip stream (RFC 1952) of `bytes`; nothing, after an error line, where there are none or zlib fails.
 std::optional<std::string> gzipDeflate(std::string_view bytes);
+
+// Fills `place` with the next bytes, at most `room`, and says how many; 0 at the end. Nothing: no more can be
+// had, and a line has said why.
+using ByteSource = std::function<std::optional<std::size_t>(char* place, std::size_t room)>;
+
+// The same of what `source` gives, of which only pieces are in memory. Nothing, too, where it ends early.
+std::optional<std::string> gzipDeflate(const ByteSource& source);
 
 // The same with the wrapper chosen: gzip (true) or zlib's own (false, RFC 1950).
 std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view bytes);

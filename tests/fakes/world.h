@@ -11,7 +11,10 @@
 #include "fakes/fake_locale.h"
 #include "fakes/fake_preferences.h"
 #include "fakes/fake_random.h"
+#include "platform/code_bundle.h"
 #include "platform/counters.h"
+#include "platform/energy_log.h"
+#include "platform/lent_files.h"
 #include "platform/root.h"
 #include "platform/work_pool.h"
 #include "protocol/veltra.h"
@@ -33,13 +36,16 @@ struct World {
   FakeDeviceProperties properties;
   FakeFileStore files;
   platform::Counters counters;
+  platform::EnergyLog energyLog{clock, counters, "/nowhere/energy.jsonl"};
+  platform::CodeBundle adaptorBundle{"/nowhere", "none"};
   platform::WorkPool pool;
+  platform::LentFiles lentFiles;
   platform::Root root{"/"};
   DeviceIdentity device{properties};
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra library{files, preferences, root};
-  const BackendServices services{http,     clock,    random, locale,  preferences,
-                                 counters, settings, device, library, pool};
+  const BackendServices services{http,          clock,    random, locale,  preferences, counters, energyLog,
+                                 adaptorBundle, settings, device, library, pool,        lentFiles};
   StandardBackendFactory factory{services};
 
   void consent() { preferences.set("DiagnosticLogSubmissionEnabled", true); }

@@ -114,8 +114,8 @@ class Door : public ListenerDelegate {
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
     _listener = std::make_unique<Listener>(
-        ipc::ListenerOptions{std::move(socket.value()), _entitlements, counters, root.entitlementsPath(),
-                             most, mostOfOneUser, readBudget},
+        ipc::ListenerOptions{std::move(socket.value()), _entitlements, lentFiles, counters,
+                             root.entitlementsPath(), most, mostOfOneUser, readBudget},
         *this);
     EXPECT_TRUE(_listener->resume());
   }
@@ -149,6 +149,7 @@ class Door : public ListenerDelegate {
  private:
   FakeFileStore _files;
   platform::Entitlements _entitlements;
+  platform::LentFiles lentFiles;
   std::unique_ptr<Listener> _listener;
 };
 

@@ -1,0 +1,52 @@
+// Address and headers of an upload. Pure functions; any thread.
+#include "backends/upload/upload_request.h"
+
+#include <fmt/printf.h>
+
+#include "base/text.h"
+
+namespace veltrad {
+
+namespace {
+
+constexpr std::uint32_t kLeastBytesPerSecond = 1024;
+// Of the answer, which goes to the log as it is.
+constexpr std::size_t kMostAnswerBytes = 1u << 20;
+constexpr std::string_view kDescription = "Callwyn QBSL log";
+
+// Beside letters, digits and "-._~" (RFC 3986, 3.4).
+constexpr std::string_view kKeptInQuery = "!$&'()*+,;=:@/?";
+
+// Whether all of it may stand in a URL; how it is put together is the HTTP client's to judge.
+bool mayBeURL(std::string_view text) {
+  return percentEncoded(text, std::string(kKeptInQuery) + "%#[]") == text;
+}
+
+}  // namespace
+
+std::string_view lastPathComponent(std::string_view path) {
+  const std::size_t end = path.find_last_not_of('/');
+  if (end == std::string_view::npos) return path.substr(0, 1);
+  path = path.substr(0, end + 1);
+  return path.substr(path.rfind('/') + 1);
+}
+
+std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
+                                                   std::string_view path, std::string gzipped) {
+  const std::string name = std::string(lastPathComponent(path)) + ".gz";
+  platform::HTTPRequest request;
+  request.url =
+      fmt::sprintf("%s?uuid=%s&sequence=%u&description=%s%%20(Uploaded%%20by%%20PKV)&filename=%s&raw=true",
+                   uploadURL, who.udid, who.sessionID, percentEncoded(kDescription, kKeptInQuery),
+                   percentEncoded(name, kKeptInQuery));
+  if (uploadURL.empty() || !mayBeURL(request.url)) return std::nullopt;
+  request.method = platform::HTTPRequest::Method::post;
+  request.lane = platform::HTTPRequest::Lane::upload;
+  request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
+  request.body = std::move(gzipped);
+  request.leastBytesPerSecond = kLeastBytesPerSecond;
+  request.mostResponseBytes = kMostAnswerBytes;
+  return request;
+}
+
+}  // namespace veltrad

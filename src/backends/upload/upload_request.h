@@ -1,0 +1,25 @@
+// The request that carries a file. Pure functions; any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/http_client.h"
+
+namespace veltrad {
+
+// What stands behind the last slash; slashes at the end do not count. "/" of the root.
+std::string_view lastPathComponent(std::string_view path);
+
+struct UploadIdentity {
+  std::string udid;
+  std::uint32_t sessionID = 0;
+};
+
+// The post of a gzipped file. Nothing: `uploadURL` and the rest make no URL.
+std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
+                                                   std::string_view path, std::string gzipped);
+
+}  // namespace veltrad

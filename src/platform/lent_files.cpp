@@ -1,0 +1,31 @@
+// What is lent, by token. Any thread.
+#include "platform/lent_files.h"
+
+#include "platform/uuid.h"
+
+namespace veltrad::platform {
+
+LentFiles::Loan LentFiles::lend(FileDescriptor file, std::function<void()> askForRemoval) {
+  std::string token = randomUUIDText();
+  auto lent = std::make_shared<const LentFile>(std::move(file), std::move(askForRemoval));
+  const Lock held(_mutex);
+  _files.emplace(token, std::move(lent));
+  return Loan(*this, std::move(token));
+}
+
+std::shared_ptr<const LentFile> LentFiles::consume(const std::string& token) const {
+  const Lock held(_mutex);
+  const auto found = _files.find(token);
+  return found != _files.end() ? found->second : nullptr;
+}
+
+void LentFiles::takeBack(const std::string& token) {
+  std::shared_ptr<const LentFile> last;  // closed without the lock
+  const Lock held(_mutex);
+  const auto found = _files.find(token);
+  if (found == _files.end()) return;
+  last = std::move(found->second);
+  _files.erase(found);
+}
+
+}  // namespace veltrad::platform
