@@ -31,7 +31,7 @@ OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters
 }
 
 OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
-  const Sent sent = put(frame);
+  const Sent sent = put(frame, kOutQueueBound + kReplyReserve);
   if (sent == Sent::full) {
     _counters.count("connection ended: the client does not read its replies");
     requestEnd();
@@ -42,7 +42,7 @@ OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
 }
 
 OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
-  const Sent sent = put(frame);
+  const Sent sent = put(frame, kOutQueueBound);
   if (sent == Sent::full) {
     _counters.count("event dropped: the client does not read");
   } else if (sent == Sent::gone) {
@@ -53,7 +53,7 @@ OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
   return sent;
 }
 
-OutQueue::Sent OutQueue::put(std::string_view frame) {
+OutQueue::Sent OutQueue::put(std::string_view frame, std::size_t bound) {
   if (frame.size() > kFrameBodyLimit + kFrameHeaderBytes) return Sent::tooLarge;
   Lock lock(_mutex);
   if (_gone) return Sent::gone;
@@ -65,7 +65,7 @@ OutQueue::Sent OutQueue::put(std::string_view frame) {
     wake();
     return Sent::done;
   }
-  if (_waiting.size() - _written + frame.size() > kOutQueueBound) return Sent::full;
+  if (_waiting.size() - _written + frame.size() > bound) return Sent::full;
   if (_written > _waiting.size() / 2) {
     _waiting.erase(0, _written);
     _written = 0;

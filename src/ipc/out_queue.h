@@ -12,8 +12,10 @@
 
 namespace veltrad::ipc {
 
-// Bytes that wait for one client at most; a frame of the largest size fits while nothing else waits.
+// Bytes that wait for one client at most, whether events or replies; a frame of the largest size fits.
 inline constexpr std::size_t kOutQueueBound = (1u << 20) + 12;
+// What replies may fill beyond it, so that events never cost a client the answer that it waits for.
+inline constexpr std::size_t kReplyReserve = 1u << 20;
 // Beyond this many waiting bytes the connection takes no further calls until the client has read some
 // answers.
 inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
@@ -35,7 +37,7 @@ class OutQueue {
   OutQueue(const OutQueue&) = delete;
   OutQueue& operator=(const OutQueue&) = delete;
 
-  // A reply, hello or refusal; `full` also ends the connection.
+  // A reply, hello or refusal, which has the reserve too; `full` also ends the connection.
   Sent sendReply(std::string_view frame);
   Sent sendEvent(std::string_view frame);
 
@@ -61,7 +63,7 @@ class OutQueue {
   void close();
 
  private:
-  Sent put(std::string_view frame);
+  Sent put(std::string_view frame, std::size_t bound);
   bool writeSome(std::string_view& bytes) REQUIRES(_mutex);
   void giveUp() REQUIRES(_mutex);
   void wake() REQUIRES(_mutex);

@@ -135,12 +135,19 @@ class Family(HTTPSTest):
 
     def test_a_client_that_does_not_read_holds_up_nobody(self):
         with self.serving(PROXY) as daemon:
-            root, child = self.join(ROOT, aggregates=True), self.join(CHILD)
+            root, child = self.join(ROOT, aggregates=True, batch=True), self.join(CHILD)
+            root.message(text="x" * 100_000)
             root.copies_now()
+            self.lab.control(path="/events/0", stall=True)
+            root.begin("flushMessagesWithCompletion:")  # answered when the copies have long filled its queue
+            self.posts("0", 1)
             begin, sent, text = time.monotonic(), 4000, "x" * 1000
             for number in range(sent):
                 child.message(number=number, text=text)
             took = time.monotonic() - begin
+            self.lab.reset()
+            daemon.wait_for_line("internalFlushMessagesWithCompletion: httppost")
+            self.assertGreater(len(root.expect()["reply"]), 100_000)
             numbers = [copy["payload"]["number"] for copy in root.copies_now()]
             self.assertEqual(numbers, list(range(len(numbers))))
             self.assertLess(len(numbers), sent)
