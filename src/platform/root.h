@@ -23,6 +23,7 @@ class Root {
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string preferencesDirectory() const { return path("var/lib/veltrad/preferences"); }
   std::string logsDirectory() const { return path("var/log/veltrad"); }
+  std::string energyLogPath() const { return path("var/log/veltrad/energy.jsonl"); }
   // The diagnostic message log's own directory; its parent is made at start, itself by the first message.
   std::string messageLogDirectory() const { return path("var/mobile/Library/Logs/Zentrel/Retired"); }
   std::string configurationDirectory() const { return path("etc/veltrad"); }

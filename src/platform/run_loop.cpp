@@ -61,6 +61,7 @@ RunLoop::~RunLoop() {
 
 void RunLoop::blockSignals() {
   ::signal(SIGPIPE, SIG_IGN);
+  ::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is an error of the write
   const sigset_t set = setOf({SIGTERM, SIGINT, SIGHUP});
   ::pthread_sigmask(SIG_BLOCK, &set, nullptr);
   if (_signals < 0) _signals = ::signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);

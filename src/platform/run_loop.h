@@ -13,7 +13,8 @@ class RunLoop {
   RunLoop(const RunLoop&) = delete;
   RunLoop& operator=(const RunLoop&) = delete;
 
-  // Blocks SIGTERM, SIGINT, SIGHUP for the process (they arrive through the loop), ignores SIGPIPE.
+  // Blocks SIGTERM, SIGINT, SIGHUP for the process (they arrive through the loop), ignores SIGPIPE and
+  // SIGXFSZ.
   void blockSignals();
   // Calls `tick` every `interval` until SIGTERM, SIGINT or stop(). Returns the signal's number, 0 after
   // stop(). After it has returned, a second signal ends the process at once with status 1.

@@ -82,8 +82,8 @@ SandboxProfile veltradSandboxProfile(const Root& root) {
            root.localeConfigurationPath(),
            // The host's own: names and certificates, zones, libraries that those load, what the machine says.
            "/etc", "/proc", "/sys/class/dmi", "/sys/devices/virtual/dmi", "/sys/firmware/devicetree",
-           "/usr/lib", "/lib", "/usr/share/zoneinfo", "/usr/share/ca-certificates",
-           "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
+           "/usr/lib", "/usr/lib64", "/usr/local/lib", "/lib", "/lib64", "/usr/share/zoneinfo",
+           "/usr/share/ca-certificates", "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
           {root.preferencesDirectory(), root.logsDirectory(), root.runDirectory(),
            messageLog.substr(0, messageLog.rfind('/'))}};
 }
