@@ -1,0 +1,120 @@
+"""The adaptor bundle, good and bad, reached by the built-in storebag without any server."""
+import json
+import os
+import shutil
+
+from harness import BUILD, Root, SystemTest, closed_port, wait_until
+
+BUNDLE = ("System/Library/PrivateFrameworks/PellmarchServices.framework/Frameworks/PellmarchPerformance.framework/"
+          "PellmarchPerformance.so")
+DEAF = "MivoBackend(sendMessage): Mivo adaptor {} does not respond to forwarding selector " \
+       "sendMessageWithMethod:respCode:dict:"
+NONE = "MivoBackend(initWithName): no Mivo adaptor: "
+THREW = "threw: no message today"
+
+
+class Adaptor(SystemTest):
+    def setUp(self):
+        self.root = Root()
+        self.addCleanup(self.root.remove)
+        self.root.prefer(veltra_storebag_url=f"https://localhost:{closed_port()}/bags")
+        self.addCleanup(os.umask, os.umask(0o022))
+        self.file = self.root.path / BUNDLE
+        self.file.parent.mkdir(parents=True)
+
+    def install(self, name):
+        self.file.unlink(missing_ok=True)
+        shutil.copy(BUILD / "lib" / f"{name}.so", self.file)
+
+    def messages(self):
+        path = self.root.path / "var/log/veltrad/example-adaptor.jsonl"
+        return [json.loads(line) for line in path.read_text().splitlines()] if path.exists() else []
+
+    def is_deaf(self, daemon, line):
+        """A session without a working adaptor: one such line a message, and the daemon goes on."""
+        session, backends = self.open()
+        self.assertEqual(backends, ["mivo"])
+        for _ in range(2):
+            before = sum(line in said for said in daemon.text)
+            self.assertEqual(session.send(codec="opus"), {"op": "send", "reply": None})
+            daemon.wait_for_line(line, before + 1)
+            self.assertEqual(sum(line in said for said in daemon.text), before + 1)
+        self.assertEqual(session.close(), 0)
+
+    def test_messages_as_they_are(self):
+        self.install("example_adaptor")
+        payload = {"codec": "opus \u00fc\n\"\\", "seconds": 12.5, "lost": -3, "most": 2**64 - 1, "video": False,
+                   "start": {"$date": 1.5e9}, "key": {"$data": "AP/+AQ=="}, "": [1, [], {"deep": {"er": ["x"]}}]}
+        with self.serving() as daemon:
+            for client_type in (7, 11, 13):
+                session, backends = self.open(client_type)
+                self.assertEqual(backends, ["mivo"])
+                self.assertEqual(session.send(65535, 65534, **payload), {"op": "send", "reply": None})
+                session.ask("send", category=client_type, type=0)
+                self.assertEqual(session.close(), 0)
+            daemon.wait_for_line("Loading default storebag 'quindle'")
+            own = [message for message in self.messages() if message["method"] > 0]
+            self.assertEqual(own, [message for client_type in (7, 11, 13) for message in (
+                {"method": 65535, "respCode": 65534, "dict": payload},
+                {"method": client_type, "respCode": 0, "dict": None})])
+
+    def test_what_cannot_be_loaded_is_tried_again(self):
+        def missing():
+            self.file.unlink(missing_ok=True)
+
+        def no_code():
+            self.file.write_text("a text")
+
+        def writable():
+            self.install("example_adaptor")
+            self.file.chmod(0o775)
+
+        def writable_directory():
+            self.install("example_adaptor")
+            self.file.parent.chmod(0o777)
+
+        def foreign():
+            self.file.parent.chmod(0o755)
+            os.chown(self.file, 12345, -1)
+
+        theirs = "expected the file and every directory above it to be owned by root or the daemon's own user"
+        table = [(missing, "No such file or directory"), (no_code, "file too short"), (writable, theirs),
+                 (writable_directory, theirs)] + ([(foreign, theirs)] if os.getuid() == 0 else [])
+        with self.serving(NONE, DEAF.format("(null)")) as daemon:
+            for spoil, reason in table:
+                with self.subTest(spoil.__name__):
+                    before = len(daemon.text)
+                    spoil()
+                    self.is_deaf(daemon, DEAF.format("(null)"))
+                    said, = (line for line in daemon.text[before:] if NONE in line)
+                    self.assertIn(reason, said)
+            self.assertEqual(self.messages(), [])
+            self.file.parent.chmod(0o755)
+            self.install("example_adaptor")
+            self.assertEqual(self.open()[1], ["mivo"])
+            wait_until(self.messages, "the start message")
+
+    def test_faulty(self):
+        deaf = DEAF.format("(null)")
+        for fault, lines, line in (("otherVersion", ("an adaptor of version 2, expected 1",), deaf),
+                                   ("otherClass", ("no class MivoAdaptor among its 1",), deaf),
+                                   ("noInstance", ("MivoAdaptor has made no instance",), deaf),
+                                   ("throwsAtCreation", ("MivoAdaptor threw: no creation today",), deaf),
+                                   ("noOperation", ("sendMessage): Mivo adaptor <MivoAdaptor: 0x",),
+                                    DEAF.partition("{}")[2]),
+                                   ("throws", ("an exception without a text",), THREW)):
+            with self.subTest(fault):
+                self.install("adaptor_" + fault)
+                with self.serving(NONE, DEAF.partition("{}")[2], THREW, "an exception without a text") as daemon:
+                    self.is_deaf(daemon, line)
+                    for text in lines:
+                        daemon.wait_for_line(text)
+
+    def test_device_without_adaptor(self):
+        self.install("example_adaptor")
+        self.root.write("etc/veltrad/device.plist", {"ProductType": "Halvorn", "UniqueDeviceID": "ab" * 20})
+        unknown = "VeltraBackend(newBackendWithName): mivo"
+        with self.serving(unknown) as daemon:
+            self.assertEqual(self.open()[1], [])
+            daemon.wait_for_line(unknown)
+        self.assertEqual(self.messages(), [])
