@@ -110,6 +110,8 @@ VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* leng
 /* The backends that report: an array of texts, or NULL when none could be had. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
+/* Of an uploaded file: the server has confirmed it, and the library has removed it. */
+VELTRA_API bool veltra_reply_removed(const veltra_reply* reply);
 /* The error of the answer (of a flush, say) or of the call itself; domain and description are NULL without
  * one. */
 VELTRA_API const char* veltra_reply_error_domain(const veltra_reply* reply);
@@ -200,6 +202,16 @@ VELTRA_API veltra_status veltra_session_send_one_shot_wait(veltra_session*, cons
 
 VELTRA_API veltra_status veltra_session_flush(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply** reply);
+/* Uploads a regular file of at most 2,147,483,647 bytes. The library opens it, without waiting for it and
+ * without following a link, and lends it to the daemon, which has no other way to it; it is named by the last
+ * component of `path`. The answer comes when the servers have answered. veltra_reply_uploaded: a request was
+ * carried out. Where the server has confirmed it, the library removes the file, if its path still names the
+ * same one (veltra_reply_removed); a file that has changed meanwhile stays. The answer's error is the
+ * library's: why nobody takes such a file, or why one that was stored could not be removed. */
+VELTRA_API veltra_status veltra_session_upload_file(veltra_session*, const char* path, veltra_callback,
+                                                    void* context);
+VELTRA_API veltra_status veltra_session_upload_file_wait(veltra_session*, const char* path,
+                                                         veltra_reply** reply);
 /* `data` is an array, borrowed, of at most 64 MiB and 500,000 values. The answer, which comes when the
  * servers have answered, says with veltra_reply_uploaded whether anybody took it; it has no error of its own.
  */

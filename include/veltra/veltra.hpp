@@ -163,6 +163,7 @@ struct Reply {
   std::optional<std::string> text;
   Backends backends;
   bool uploaded = false;
+  bool removed = false;        // of an uploaded file
   std::optional<Error> error;  // of the answer, or of the call where the status is not VELTRA_OK
 
   explicit operator bool() const { return status == VELTRA_OK; }
@@ -180,6 +181,7 @@ struct Reply {
       }
     }
     made.uploaded = veltra_reply_uploaded(reply);
+    made.removed = veltra_reply_removed(reply);
     if (const char* description = veltra_reply_error_description(reply)) {
       made.error =
           Error{made.status, veltra_reply_error_domain(reply), veltra_reply_error_code(reply), description};
@@ -301,6 +303,13 @@ class Session {
     return promised([&](Callback callback) {
       const veltra_session_options plain = identityOf(who);
       return call(std::move(callback), &veltra_session_send_one_shot, &plain, category, type, payload.get());
+    });
+  }
+  // Takes as long as the servers do. A file that the server has confirmed is `removed`, unless `error` says
+  // why not; one that is not `uploaded` stays, and `error` says why where the library sees it.
+  std::future<Reply> uploadFile(const std::string& path) {
+    return promised([&](Callback callback) {
+      return call(std::move(callback), &veltra_session_upload_file, path.c_str());
     });
   }
   // `data` is an array. Takes as long as the servers do; the reply's `uploaded` says whether anybody took it.

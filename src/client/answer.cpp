@@ -56,6 +56,19 @@ Answer answerOfReply(std::string_view body) {
   return answer;
 }
 
+void settleUpload(veltra_reply& answer) {
+  const auto file = std::exchange(answer.file, nullptr);
+  if (!file) return;
+  std::optional<std::string> problem;
+  if (file->removalAsked()) {
+    problem = file->remove();
+    answer.removed = !problem;
+  } else if (answer.status == VELTRA_OK && !answer.uploaded) {
+    problem = file->problem();
+  }
+  if (problem && !answer.error) answer.error = ReportingError{kVeltraErrorDomain, -1, std::move(*problem)};
+}
+
 }  // namespace veltrad
 
 veltra_status veltra_reply_status(const veltra_reply* reply) {
@@ -74,6 +87,10 @@ const veltra_value* veltra_reply_backends(const veltra_reply* reply) {
 
 bool veltra_reply_uploaded(const veltra_reply* reply) {
   return reply && reply->uploaded;
+}
+
+bool veltra_reply_removed(const veltra_reply* reply) {
+  return reply && reply->removed;
 }
 
 const char* veltra_reply_error_domain(const veltra_reply* reply) {

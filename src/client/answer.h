@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "base/value.h"
+#include "client/uploaded_file.h"
 #include "client/value_node.h"
 #include "protocol/error.h"
 #include "veltra/veltra.h"
@@ -17,7 +18,9 @@ struct veltra_reply {
   std::optional<std::string> text;
   veltrad::ValuePointer backends;
   bool uploaded = false;
+  bool removed = false;
   std::optional<veltrad::ReportingError> error;
+  std::shared_ptr<veltrad::UploadedFile> file;  // of an upload that is not settled
 };
 
 namespace veltrad {
@@ -28,6 +31,9 @@ using Answer = std::unique_ptr<veltra_reply>;
 Answer answerOfReply(std::string_view body);
 // A call that ended without the daemon's word; the description is the status's own text unless one is given.
 Answer answerOfStatus(veltra_status status, const char* description = nullptr);
+// What an upload's answer means for its file: removes it where the daemon has asked for that, and says why it
+// stays or was not taken. For any other answer nothing.
+void settleUpload(veltra_reply& answer);
 // {"domain", "code", "description"} as the wire carries it; what is missing or of another type is empty.
 ReportingError errorOfDictionary(const Dictionary& dictionary);
 

@@ -54,12 +54,13 @@ Entries identity(const veltra_session_options& options) {
   return arguments;
 }
 
-CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries arguments) {
+CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries arguments,
+                      std::uint8_t descriptors = 0) {
   Entries body;
   body.reserve(2);
   body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
   body.emplace_back("op", operation);
-  std::string frame = ipc::makeFrame(kind, 0, Dictionary::fromEntries(std::move(body)));
+  std::string frame = ipc::makeFrame(kind, 0, Dictionary::fromEntries(std::move(body)), descriptors);
   if (!ipc::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
   return {VELTRA_OK, std::move(frame)};
 }
@@ -113,6 +114,22 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
   if (payload) arguments.emplace_back("payload", dictionaryOfNode(payload));
   arguments.emplace_back("type", static_cast<unsigned>(type));
   return callFrame(kSendOneShot, std::move(arguments));
+}
+
+CallFrame uploadFileFrame(const char* path) {
+  if (!path) return {VELTRA_INVALID, {}};
+  auto file = std::make_shared<UploadedFile>(path);
+  CallFrame call = frameOfKind(ipc::FrameKind::call, kUploadFile, {{"path", toUTF8(file->absolutePath())}},
+                               file->descriptor() >= 0 ? 1 : 0);
+  call.file = std::move(file);
+  return call;
+}
+
+std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
+  const std::string* operation = event.string("op");
+  if (!operation || *operation != "removeUploadedFile:") return std::nullopt;
+  const Dictionary* arguments = event.dictionary("args");
+  return arguments ? arguments->uint32("call").value_or(0) : 0;
 }
 
 CallFrame logDataFrame(const veltra_value* data) {

@@ -2,10 +2,13 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
 #include "base/value.h"
+#include "client/uploaded_file.h"
 #include "client/value_node.h"
 #include "veltra/veltra.h"
 
@@ -19,14 +22,19 @@ inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:
 inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
 inline constexpr const char* kSendOneShot =
     "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
+inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
 inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
 inline constexpr const char* kSetSessionInfo =
     "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
 inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
 
+// The upload whose file the daemon's event asks to remove; nothing for other events.
+std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event);
+
 struct CallFrame {
-  veltra_status status;  // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE
-  std::string frame;     // empty unless VELTRA_OK
+  veltra_status status;                          // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE
+  std::string frame;                             // empty unless VELTRA_OK
+  std::shared_ptr<UploadedFile> file = nullptr;  // of an upload
 };
 
 CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});
@@ -42,6 +50,8 @@ CallFrame sessionInfoFrame(const veltra_session_options& options);
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload);
 
+// `path` is not null. Without the file's descriptor where it cannot be opened: the daemon then says why.
+CallFrame uploadFileFrame(const char* path);
 // `data` is an array; the one call whose frame may be a large one.
 CallFrame logDataFrame(const veltra_value* data);
 

@@ -12,6 +12,7 @@
 #include <system_error>
 
 #include "base/property_list.h"
+#include "client/calls.h"
 
 namespace veltrad {
 
@@ -73,16 +74,16 @@ DaemonConnection::~DaemonConnection() {
 
 // ---- Calls out ----
 
-veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context) {
+veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context, File file) {
   Lock lock(_lock);
-  return enqueue(std::move(frame), Call{nullptr, callback, context});
+  return enqueue(std::move(frame), Call{nullptr, callback, context, std::move(file)});
 }
 
-Answer DaemonConnection::sendAndWait(std::string frame) {
+Answer DaemonConnection::sendAndWait(std::string frame, File file) {
   if (onOwnThread()) return answerOfStatus(VELTRA_WOULD_DEADLOCK);
   Waiter waiter;
   Lock lock(_lock);
-  const veltra_status status = enqueue(std::move(frame), Call{&waiter, nullptr, nullptr});
+  const veltra_status status = enqueue(std::move(frame), Call{&waiter, nullptr, nullptr, std::move(file)});
   if (status != VELTRA_OK) return answerOfStatus(status);
   while (!waiter.answer) {
     if (_reader == Reader::nobody) {
@@ -107,10 +108,10 @@ veltra_status DaemonConnection::enqueue(std::string frame, const Call& call) {
     ++_counts.dropped;
     return VELTRA_QUEUE_FULL;
   }
-  const bool answered = call.waiter || call.callback;
+  const bool answered = call.waiter || call.callback || call.file;
   const std::uint32_t callID = answered ? freeCallID() : 0;
   if (answered) setCallID(frame, callID);
-  switch (_out.write(_socket.get(), std::move(frame))) {
+  switch (_out.write(_socket.get(), std::move(frame), call.file)) {
     case OutFrames::Wrote::gone:
       ++_counts.dropped;
       stopWriting();
@@ -120,7 +121,7 @@ veltra_status DaemonConnection::enqueue(std::string frame, const Call& call) {
       break;
   }
   if (answered) _calls.emplace(callID, call);
-  if (call.callback) ++_callbacks;
+  if (answered && !call.waiter) ++_unwaited;
   updateInterest();
   return VELTRA_OK;
 }
@@ -175,7 +176,7 @@ bool DaemonConnection::takeFrames() {
     if (frame.header.kind == ipc::FrameKind::refusal) return false;
     if (frame.header.kind == ipc::FrameKind::reply && frame.header.callID != 0) {
       _arrived.push_back({frame.header.callID, answerOfReply(frame.body), {}});
-    } else if (frame.header.kind == ipc::FrameKind::event && _handler) {
+    } else if (frame.header.kind == ipc::FrameKind::event) {
       auto body = parseBinaryPropertyList(frame.body);
       const Dictionary* event = body ? body.value().asDictionary() : nullptr;
       if (event) _arrived.push_back({0, nullptr, *event});
@@ -229,20 +230,29 @@ void DaemonConnection::passOnReading() {
 void DaemonConnection::deliver() {
   for (Arrived& arrived : _arrived) {
     if (arrived.callID == 0) {
-      makeReady({nullptr, nullptr, nullptr, std::move(arrived.event)});
+      takeEvent(std::move(arrived.event));
       continue;
     }
-    const auto at = _calls.find(arrived.callID);
-    if (at == _calls.end()) continue;
-    const Call call = at->second;
-    _calls.erase(at);
-    if (call.callback) --_callbacks;
-    finish(call, std::move(arrived.answer));
+    const auto call = _calls.extract(arrived.callID);
+    if (call.empty()) continue;
+    if (!call.mapped().waiter) --_unwaited;
+    finish(call.mapped(), std::move(arrived.answer));
   }
   _arrived.clear();
 }
 
+// A request to remove a file comes before the answer to its upload; who takes that acts on it.
+void DaemonConnection::takeEvent(Dictionary event) {
+  if (const auto callID = callToRemoveFileOf(event)) {
+    const auto at = _calls.find(*callID);
+    if (at != _calls.end() && at->second.file) at->second.file->askForRemoval();
+  } else if (_handler) {
+    makeReady({nullptr, nullptr, nullptr, std::move(event)});
+  }
+}
+
 void DaemonConnection::finish(const Call& call, Answer answer) {
+  answer->file = call.file;
   ++(answer->status == VELTRA_NO_REPLY ? _counts.unanswered : _counts.replies);
   if (call.waiter) {
     call.waiter->answer = std::move(answer);
@@ -253,7 +263,7 @@ void DaemonConnection::finish(const Call& call, Answer answer) {
 }
 
 void DaemonConnection::makeReady(Ready item) {
-  if (!item.callback) {
+  if (!item.answer) {
     if (_readyEvents == kMostWaitingEvents) {
       ++_counts.dropped_events;
       return;
@@ -273,7 +283,7 @@ void DaemonConnection::end() {
   unwatch();
   std::vector<std::pair<std::uint32_t, Call>> open(_calls.begin(), _calls.end());
   _calls.clear();
-  _callbacks = 0;
+  _unwaited = 0;
   std::sort(open.begin(), open.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
   for (const auto& [callID, call] : open) finish(call, answerOfStatus(VELTRA_NO_REPLY, kConnectionEnded));
 }
@@ -355,11 +365,12 @@ bool DaemonConnection::runReady() {
     _readyEvents = 0;
   }
   for (Ready& item : batch) {
-    if (item.callback) {
-      item.callback(item.context, item.answer.get());
-    } else {
+    if (!item.answer) {
       _handler(item.event);
+      continue;
     }
+    settleUpload(*item.answer);
+    if (item.callback) item.callback(item.context, item.answer.get());
   }
   Lock lock(_lock);
   return !_stopping || !_ready.empty();
@@ -377,7 +388,7 @@ void DaemonConnection::unwatch() {
 void DaemonConnection::updateInterest() {
   if (!_watched) return;
   std::uint32_t wanted = EPOLLRDHUP;
-  if (_reader != Reader::waiter && (_callbacks > 0 || _handler)) wanted |= EPOLLIN;
+  if (_reader != Reader::waiter && (_unwaited > 0 || _handler)) wanted |= EPOLLIN;
   if (!_out.empty()) wanted |= EPOLLOUT;
   if (std::exchange(_interest, wanted) == wanted) return;
   epoll_event socketEvent{};

@@ -41,17 +41,21 @@ class DaemonConnection {
   // Gets an event's body on the connection's thread.
   using EventHandler = std::function<void(const Dictionary&)>;
 
-  // Null when the system gives no descriptors or no thread; `error` says which. Without a handler events are
-  // dropped unread.
+  // Null when the system gives no descriptors or no thread; `error` says which. Without a handler events that
+  // are not about an upload are dropped.
   static std::shared_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
                                                 EventHandler handler, std::string& error);
   ~DaemonConnection();
   DaemonConnection(const DaemonConnection&) = delete;
   DaemonConnection& operator=(const DaemonConnection&) = delete;
 
-  // `frame` is a call's, its call id still 0. Without a callback no answer is asked for.
-  veltra_status send(std::string frame, veltra_callback callback, void* context);
-  Answer sendAndWait(std::string frame);
+  using File = std::shared_ptr<UploadedFile>;
+
+  // `frame` is a call's, its call id still 0. Without a callback no answer is asked for, unless there is a
+  // file that the answer is about.
+  veltra_status send(std::string frame, veltra_callback callback, void* context, File file = nullptr);
+  // The answer is still to be settled (settleUpload), on the caller's thread.
+  Answer sendAndWait(std::string frame, File file = nullptr);
   bool onOwnThread() const {
     return _ownThread.load(std::memory_order_relaxed) == std::this_thread::get_id();
   }
@@ -71,6 +75,7 @@ class DaemonConnection {
     Waiter* waiter = nullptr;  // or else a callback
     veltra_callback callback = nullptr;
     void* context = nullptr;
+    File file;  // of an upload
   };
   // What came in with one read; an event when `callID` is 0.
   struct Arrived {
@@ -78,7 +83,7 @@ class DaemonConnection {
     Answer answer;
     Dictionary event;
   };
-  // What the connection's thread is to run; an event when there is no callback.
+  // What the connection's thread is to run; an event when there is no answer.
   struct Ready {
     veltra_callback callback = nullptr;
     void* context = nullptr;
@@ -103,6 +108,7 @@ class DaemonConnection {
   void readAsWaiter(const Waiter& waiter) REQUIRES(_lock);
   void readAsOwnThread() REQUIRES(_lock);
   void deliver() REQUIRES(_lock);
+  void takeEvent(Dictionary event) REQUIRES(_lock);
   void finish(const Call& call, Answer answer) REQUIRES(_lock);
   void makeReady(Ready item) REQUIRES(_lock);
   void passOnReading() REQUIRES(_lock);
@@ -131,7 +137,7 @@ class DaemonConnection {
   std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
   OutFrames _out GUARDED_BY(_lock);
   std::unordered_map<std::uint32_t, Call> _calls GUARDED_BY(_lock);
-  std::size_t _callbacks GUARDED_BY(_lock) = 0;  // of _calls
+  std::size_t _unwaited GUARDED_BY(_lock) = 0;  // of _calls: their answers are for the own thread
   std::uint32_t _lastCallID GUARDED_BY(_lock) = 0;
   std::deque<Ready> _ready GUARDED_BY(_lock);
   std::size_t _readyEvents GUARDED_BY(_lock) = 0;  // of _ready

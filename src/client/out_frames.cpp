@@ -6,63 +6,109 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstring>
+
+#include "ipc/frame.h"
 
 namespace veltrad {
 
 namespace {
+
 constexpr std::size_t kFramesAtOnce = 64;
 constexpr int kFlags = MSG_DONTWAIT | MSG_NOSIGNAL;
+
+bool full(int error) {
+  return error == EAGAIN || error == ENOBUFS;
+}
+
+ssize_t sendWithDescriptor(int socket, msghdr message, int descriptor) {
+  alignas(cmsghdr) char control[CMSG_SPACE(sizeof descriptor)] = {};
+  message.msg_control = control;
+  message.msg_controllen = sizeof control;
+  cmsghdr* part = CMSG_FIRSTHDR(&message);
+  part->cmsg_level = SOL_SOCKET;
+  part->cmsg_type = SCM_RIGHTS;
+  part->cmsg_len = CMSG_LEN(sizeof descriptor);
+  std::memcpy(CMSG_DATA(part), &descriptor, sizeof descriptor);
+  return ::sendmsg(socket, &message, kFlags);
+}
+
+// The daemon then says that it has got no file.
+void announceNoDescriptor(std::string& frame) {
+  ipc::FrameHeader header = ipc::decodeFrameHeader(frame.data());
+  header.descriptors = 0;
+  ipc::encodeFrameHeader(header, frame.data());
+}
+
 }  // namespace
 
-OutFrames::Wrote OutFrames::write(int socket, std::string frame) {
-  if (!_frames.empty()) {
-    _bytes += frame.size();
-    _frames.push_back(std::move(frame));
-    return Wrote::some;
+OutFrames::Wrote OutFrames::write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file) {
+  if (file && file->descriptor() < 0) file = nullptr;
+  const bool first = _frames.empty();
+  const bool lends = file != nullptr;
+  std::size_t sent = 0;
+  if (first && !lends) {
+    ssize_t count;
+    do {
+      count = ::send(socket, frame.data(), frame.size(), kFlags);
+    } while (count < 0 && errno == EINTR);
+    if (count < 0 && !full(errno)) return Wrote::gone;
+    if (count > 0) sent = static_cast<std::size_t>(count);
+    if (sent == frame.size()) {
+      ++_written;
+      return Wrote::all;
+    }
+    _firstTaken = sent;
   }
-  ssize_t count;
-  do {
-    count = ::send(socket, frame.data(), frame.size(), kFlags);
-  } while (count < 0 && errno == EINTR);
-  if (count < 0 && errno != EAGAIN && errno != ENOBUFS) return Wrote::gone;
-  const std::size_t taken = count > 0 ? static_cast<std::size_t>(count) : 0;
-  if (taken == frame.size()) {
-    ++_written;
-    return Wrote::all;
-  }
-  _bytes = frame.size() - taken;
-  _firstTaken = taken;
-  _frames.push_back(std::move(frame));
-  return Wrote::some;
+  _bytes += frame.size() - sent;
+  _frames.push_back({std::move(frame), std::move(file)});
+  if (!first || !lends) return Wrote::some;
+  const Wrote wrote = writeWaiting(socket);
+  if (wrote == Wrote::gone) clear();
+  return wrote;
 }
 
 OutFrames::Wrote OutFrames::writeWaiting(int socket) {
   while (!_frames.empty()) {
-    iovec parts[kFramesAtOnce];
-    std::size_t count = 0;
-    for (std::string& frame : _frames) {
-      const std::size_t skipped = count == 0 ? _firstTaken : 0;
-      parts[count++] = {frame.data() + skipped, frame.size() - skipped};
-      if (count == kFramesAtOnce) break;
+    const ssize_t sent = send(socket);
+    if (sent >= 0) {
+      taken(static_cast<std::size_t>(sent));
+    } else if (errno == ETOOMANYREFS && _frames.front().file) {  // too many descriptors are on their way
+      announceNoDescriptor(_frames.front().bytes);
+      _frames.front().file = nullptr;
+    } else if (errno != EINTR) {
+      return full(errno) ? Wrote::some : Wrote::gone;
     }
-    msghdr message{};
-    message.msg_iov = parts;
-    message.msg_iovlen = count;
-    const ssize_t sent = ::sendmsg(socket, &message, kFlags);
-    if (sent < 0 && errno == EINTR) continue;
-    if (sent < 0) return errno == EAGAIN || errno == ENOBUFS ? Wrote::some : Wrote::gone;
-    taken(static_cast<std::size_t>(sent));
   }
   return Wrote::all;
+}
+
+// As many frames as go at once: a descriptor travels with the first byte of the first.
+ssize_t OutFrames::send(int socket) {
+  iovec parts[kFramesAtOnce];
+  std::size_t count = 0;
+  for (Waiting& frame : _frames) {
+    if (count == kFramesAtOnce || (count > 0 && frame.file)) break;
+    const std::size_t skipped = count == 0 ? _firstTaken : 0;
+    parts[count++] = {frame.bytes.data() + skipped, frame.bytes.size() - skipped};
+  }
+  msghdr message{};
+  message.msg_iov = parts;
+  message.msg_iovlen = count;
+  Waiting& first = _frames.front();
+  if (!first.file) return ::sendmsg(socket, &message, kFlags);
+  const ssize_t sent = sendWithDescriptor(socket, message, first.file->descriptor());
+  if (sent > 0) first.file = nullptr;
+  return sent;
 }
 
 void OutFrames::taken(std::size_t count) {
   _bytes -= count;
   while (count > 0) {
-    const std::size_t now = std::min(count, _frames.front().size() - _firstTaken);
+    const std::size_t now = std::min(count, _frames.front().bytes.size() - _firstTaken);
     count -= now;
     _firstTaken += now;
-    if (_firstTaken < _frames.front().size()) return;
+    if (_firstTaken < _frames.front().bytes.size()) return;
     _frames.pop_front();
     _firstTaken = 0;
     ++_written;

@@ -1,10 +1,15 @@
 // The frames of one session that wait for room in the socket. Under its connection's lock.
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <deque>
+#include <memory>
 #include <string>
 #include <string_view>
+
+#include "client/uploaded_file.h"
 
 namespace veltrad {
 
@@ -22,8 +27,9 @@ class OutFrames {
   std::size_t bytes() const { return _bytes; }
   std::size_t calls() const { return _frames.size(); }
 
-  // Writes `frame` at once when nothing waits before it; what the socket does not take, waits.
-  Wrote write(int socket, std::string frame);
+  // Writes `frame` at once when nothing waits before it; what the socket does not take, waits. Where its
+  // header announces a descriptor, `file` is open.
+  Wrote write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file = nullptr);
   // Writes what waits.
   Wrote writeWaiting(int socket);
   // Drops what waits; returns how many frames that were.
@@ -32,9 +38,15 @@ class OutFrames {
   std::uint64_t written() const { return _written; }
 
  private:
+  struct Waiting {
+    std::string bytes;
+    std::shared_ptr<const UploadedFile> file;  // null: no descriptor is to travel any more
+  };
+
+  ssize_t send(int socket);
   void taken(std::size_t count);
 
-  std::deque<std::string> _frames;
+  std::deque<Waiting> _frames;
   std::size_t _firstTaken = 0;  // bytes of the first frame that the socket has
   std::size_t _bytes = 0;       // that wait
   std::uint64_t _written = 0;

@@ -47,7 +47,7 @@ veltrad::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_ca
 veltra_status send(veltra_session* session, CallFrame call, veltra_callback callback, void* context) {
   if (!session) return VELTRA_INVALID;
   if (call.status != VELTRA_OK) return call.status;
-  return session->connection->send(std::move(call.frame), callback, context);
+  return session->connection->send(std::move(call.frame), callback, context, std::move(call.file));
 }
 
 veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply** reply) {
@@ -55,7 +55,8 @@ veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply*
   Answer answer;
   if (status == VELTRA_OK) {
     const auto connection = session->connection;  // outlasts a close() that ends this call
-    answer = connection->sendAndWait(std::move(call.frame));
+    answer = connection->sendAndWait(std::move(call.frame), std::move(call.file));
+    veltrad::settleUpload(*answer);
   } else {
     answer = veltrad::answerOfStatus(status);
   }
@@ -164,6 +165,16 @@ veltra_status veltra_session_flush(veltra_session* session, veltra_callback call
 
 veltra_status veltra_session_flush_wait(veltra_session* session, veltra_reply** reply) {
   return sendAndWait(session, veltrad::callFrame(veltrad::kFlushMessages), reply);
+}
+
+veltra_status veltra_session_upload_file(veltra_session* session, const char* path, veltra_callback callback,
+                                         void* context) {
+  return send(session, veltrad::uploadFileFrame(path), callback, context);
+}
+
+veltra_status veltra_session_upload_file_wait(veltra_session* session, const char* path,
+                                              veltra_reply** reply) {
+  return sendAndWait(session, veltrad::uploadFileFrame(path), reply);
 }
 
 veltra_status veltra_session_upload_log_data(veltra_session* session, const veltra_value* data,

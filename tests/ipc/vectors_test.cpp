@@ -46,6 +46,9 @@ TEST(Vectors, OfTheDocumentAreWhatTheCodeWrites) {
       {"event", makeFrame(FrameKind::event, 0,
                           {{"op", "sendMessageToClient:timestamp:category:type:payload:"},
                            {"args", Dictionary{{"timestamp", 1.5}, {"category", 65535}, {"type", 2}}}})},
+      {"remove-event",
+       makeFrame(FrameKind::event, 0,
+                 {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", 0x01020304}}}})},
       {"refusal", makeFrame(FrameKind::refusal, 0,
                             error("The client speaks wire version 2, the daemon speaks version 1."))},
   };

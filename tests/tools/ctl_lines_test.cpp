@@ -32,7 +32,7 @@ TEST(SessionLines, saysWhatIsWrong) {
       {"[1]", "expected an object such as {\"op\":\"flush\"}, found an array"},
       {R"({"$date":1})", "found a date"},
       {"{}",
-       "no \"op\": expected one of send, flush, states, displayURL, uploadLogData, "
+       "no \"op\": expected one of send, flush, states, displayURL, uploadFile, uploadLogData, "
        "restart, sleep, finish"},
       {R"({"op":5})", "\"op\": expected a text, found an integer"},
       {R"({"op":"Send"})", "unknown op \"Send\": expected one of send,"},

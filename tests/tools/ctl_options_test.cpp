@@ -48,10 +48,10 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
   const std::pair<const char*, const char*> cases[] = {
       {"",
        "veltractl: no command: expected session, send, one-shot, states, display-url, "
-       "upload-log-data or stats"},
+       "upload, upload-log-data or stats"},
       {"explode",
        "unknown command \"explode\": expected session, send, one-shot, states, display-url, "
-       "upload-log-data or stats"},
+       "upload, upload-log-data or stats"},
       {"--explode", "unknown option \"--explode\""},
       {"session stats", "\"stats\" is not expected here"},
       {"session --client-type 2147483648", "from -2147483648 to 2147483647, found \"2147483648\""},
@@ -75,8 +75,8 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
 
 TEST(Options, helpHasAnExampleAndOffersWhatThereIs) {
   for (const char* line :
-       {"--help", "session --help", "send --help", "one-shot --help", "upload-log-data --help",
-        "states --help", "display-url --help", "stats --help", "--version"}) {
+       {"--help", "session --help", "send --help", "one-shot --help", "upload --help",
+        "upload-log-data --help", "states --help", "display-url --help", "stats --help", "--version"}) {
     const Ending ending = parsed<Ending>(line);
     EXPECT_TRUE(ending.status == 0 && ending.errorOutput.empty()) << line;
     EXPECT_THAT(ending.output, AnyOf(HasSubstr("Example"), "veltractl 8.0\n")) << line;

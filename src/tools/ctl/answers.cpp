@@ -57,6 +57,7 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
     case Operation::finish:
       text += ",\"reply\":" + formatReply(answer.reply);
       break;
+    case Operation::uploadFile:
     case Operation::uploadLogData:
       text += answer.uploaded ? ",\"uploaded\":true" : ",\"uploaded\":false";
       break;

@@ -26,6 +26,7 @@ struct Answer {
   std::optional<std::vector<std::string>> backends;
   std::optional<AnswerError> error;
   bool uploaded = false;
+  bool removed = false;  // an uploaded file
 };
 
 // A copy of a message, for a session that aggregates. All empty: aggregation has ended.

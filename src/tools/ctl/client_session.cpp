@@ -12,6 +12,8 @@
 namespace veltrad::ctl {
 namespace {
 
+constexpr std::chrono::milliseconds kProgressInterval{500};
+
 std::vector<std::string> textsOf(const veltra_value* array) {
   std::vector<std::string> texts;
   for (std::size_t index = 0; index < veltra_count(array); ++index) {
@@ -29,6 +31,7 @@ Answer answerOf(const veltra_reply* reply) {
   if (const char* text = veltra_reply_text(reply, &length)) answer.reply.emplace(text, length);
   if (const veltra_value* backends = veltra_reply_backends(reply)) answer.backends = textsOf(backends);
   answer.uploaded = veltra_reply_uploaded(reply);
+  answer.removed = veltra_reply_removed(reply);
   const char* domain = veltra_reply_error_domain(reply);
   const char* description = veltra_reply_error_description(reply);
   if (domain && description) answer.error = AnswerError{domain, veltra_reply_error_code(reply), description};
@@ -146,6 +149,14 @@ std::optional<Answer> ClientSession::displayURL() {
   });
 }
 
+std::optional<Answer> ClientSession::uploadFile(const std::string& path, const Progress& progress) {
+  return await(
+      [this, &path](veltra_callback callback, void* context) {
+        return veltra_session_upload_file(_session, path.c_str(), callback, context);
+      },
+      progress);
+}
+
 std::optional<Answer> ClientSession::uploadLogData(const Array& data) {
   const VeltraValue value = toVeltraValue(Value(data));
   return await([this, &value](veltra_callback callback, void* context) {
@@ -164,10 +175,17 @@ std::uint64_t ClientSession::close() {
   return session ? veltra_session_close(session) : 0;
 }
 
-std::optional<Answer> ClientSession::await(const Call& call) {
+std::optional<Answer> ClientSession::await(const Call& call, const Progress& progress) {
   const veltra_status status = call(&ClientSession::answered, this);
   if (status != VELTRA_OK) return answerOfFailure(status);
-  if (_interrupt.wait(_arrived.get()) == Interrupt::Wake::interrupted) return std::nullopt;
+  const auto begin = std::chrono::steady_clock::now();
+  const auto interval = progress ? std::optional(kProgressInterval) : std::nullopt;
+  auto wake = Interrupt::Wake::timeout;
+  while ((wake = _interrupt.wait(_arrived.get(), interval)) == Interrupt::Wake::timeout) {
+    progress(std::chrono::duration_cast<std::chrono::seconds>(std::chrono::steady_clock::now() - begin));
+  }
+  if (progress) progress(std::nullopt);
+  if (wake == Interrupt::Wake::interrupted) return std::nullopt;
   eventfd_t arrived = 0;
   eventfd_read(_arrived.get(), &arrived);
   Lock lock(_mutex);

@@ -1,6 +1,7 @@
 // One session with the daemon, through the C interface. Own thread only.
 #pragma once
 
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -41,6 +42,10 @@ class ClientSession {
   std::optional<Answer> flush();
   std::optional<Answer> states(const std::optional<Dictionary>& userInfo);
   std::optional<Answer> displayURL();
+  // While it is waited for, `progress` (when there is one) gets the time that has passed, twice a second, and
+  // nothing at the end.
+  using Progress = std::function<void(std::optional<std::chrono::seconds>)>;
+  std::optional<Answer> uploadFile(const std::string& path, const Progress& progress = nullptr);
   std::optional<Answer> uploadLogData(const Array& data);
   std::optional<Answer> finish();
 
@@ -50,7 +55,7 @@ class ClientSession {
  private:
   using Call = std::function<veltra_status(veltra_callback, void*)>;
   std::optional<std::string> create(veltra_session_options& options, const std::optional<std::string>& root);
-  std::optional<Answer> await(const Call& call);
+  std::optional<Answer> await(const Call& call, const Progress& progress = nullptr);
   // Both on the library's thread.
   static void answered(void* context, const veltra_reply* reply);
   static void aggregated(void* context, const veltra_value* sessionInfo, double timestamp,

@@ -10,6 +10,7 @@ enum class Operation {
   flush,
   states,
   displayURL,
+  uploadFile,
   uploadLogData,
   restart,
   sleep,
@@ -31,6 +32,8 @@ constexpr const char* operationName(Operation operation) {
       return "states";
     case Operation::displayURL:
       return "displayURL";
+    case Operation::uploadFile:
+      return "uploadFile";
     case Operation::uploadLogData:
       return "uploadLogData";
     case Operation::restart:

@@ -18,7 +18,7 @@ namespace {
 
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
-    "expected session, send, one-shot, states, display-url, upload-log-data or stats";
+    "expected session, send, one-shot, states, display-url, upload, upload-log-data or stats";
 
 // As they stand on the command line, before they are put together.
 struct Texts {
@@ -95,6 +95,7 @@ constexpr const char* kSessionFooter = R"(One JSON object a line, answered by on
   {"op":"flush"}
   {"op":"states","userInfo":{"clientName":"phone"}}
   {"op":"displayURL"}
+  {"op":"uploadFile","path":"a.log"}
   {"op":"uploadLogData","data":[{"file":"a.log"},1]}
   {"op":"restart"}            start again
   {"op":"sleep","ms":100}
@@ -187,6 +188,15 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
 }
 
 void addUploads(CLI::App& app, Options& options, Texts& texts) {
+  CLI::App* file = addCommand(app, options, Command::upload, "upload", "Upload a file");
+  file->add_option("file", options.file, "A regular file; it is removed once the server has confirmed it")
+      ->type_name("")
+      ->required();
+  addIdentity(*file, options.identity, texts, true);
+  file->footer(
+      "Waits for the server, and says what became of the file. Exit status 1, too, when it was not "
+      "uploaded.\n\n"
+      "Example:\n  veltractl upload --client-type 7 crash.log");
   CLI::App* logData =
       addCommand(app, options, Command::uploadLogData, "upload-log-data", "Upload an array of log data");
   logData

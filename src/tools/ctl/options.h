@@ -21,7 +21,7 @@ struct Identity {
   std::optional<Dictionary> userInfo;
 };
 
-enum class Command { session, send, oneShot, states, displayURL, uploadLogData, stats };
+enum class Command { session, send, oneShot, states, displayURL, upload, uploadLogData, stats };
 
 struct Options {
   Command command = Command::session;
@@ -34,7 +34,7 @@ struct Options {
   std::uint16_t type = 0;             // likewise
   std::uint32_t flag = 0;             // send
   std::optional<Dictionary> payload;  // send, oneShot; absent without KEY=VALUE
-  std::string file;                   // uploadLogData
+  std::string file;                   // upload, uploadLogData
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line.

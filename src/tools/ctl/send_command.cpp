@@ -1,5 +1,5 @@
-// `veltractl send`, `one-shot`, `states`, `display-url` and `upload-log-data`: one call on a connection of
-// its own. The main thread.
+// `veltractl send`, `one-shot`, `states`, `display-url`, `upload` and `upload-log-data`: one call on a
+// connection of its own. The main thread.
 #include "tools/ctl/send_command.h"
 
 #include <fmt/format.h>
@@ -8,6 +8,7 @@
 #include "tools/ctl/client_session.h"
 #include "tools/ctl/given_values.h"
 #include "tools/ctl/print.h"
+#include "tools/ctl/upload_report.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -21,6 +22,8 @@ Operation operationOf(Command command) {
       return Operation::states;
     case Command::displayURL:
       return Operation::displayURL;
+    case Command::upload:
+      return Operation::uploadFile;
     case Command::uploadLogData:
       return Operation::uploadLogData;
     default:
@@ -42,6 +45,8 @@ std::optional<Answer> call(ClientSession& session, const Options& options, const
       return session.states(options.identity.userInfo);
     case Operation::displayURL:
       return session.displayURL();
+    case Operation::uploadFile:
+      return session.uploadFile(options.file, uploadProgress(options.file));
     case Operation::uploadLogData:
       return session.uploadLogData(logData);
     default:
@@ -55,10 +60,11 @@ int failed(const std::optional<Answer>& answer) {
   return 1;
 }
 
-int finish(Operation operation, const std::optional<Answer>& answer) {
+int finish(Operation operation, const Options& options, const std::optional<Answer>& answer) {
   if (!answer) return failed(answer);
   if (!printLine(formatAnswer(operation, *answer))) return 1;
   if (answer->status != VELTRA_OK) return failed(answer);
+  if (operation == Operation::uploadFile) return reportUpload(options.file, *answer) ? 0 : 1;
   if (operation != Operation::uploadLogData || answer->uploaded) return 0;
   complain("Nobody took the log data: see what the daemon's log says.");
   return 1;
@@ -69,7 +75,7 @@ int runOneShot(const Options& options, ClientSession& session) {
     complain(*problem);
     return 1;
   }
-  return finish(Operation::oneShot,
+  return finish(Operation::oneShot, options,
                 session.sendOneShot(options.identity, options.category, options.type, options.payload));
 }
 
@@ -95,7 +101,7 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
   if (!started || started->status != VELTRA_OK) return failed(started);
   if (!started->backends)
     complain("Nothing reports for this client: the daemon has no configuration for its client type.");
-  return finish(operationOf(options.command), call(session, options, logData));
+  return finish(operationOf(options.command), options, call(session, options, logData));
 }
 
 }  // namespace veltrad::ctl

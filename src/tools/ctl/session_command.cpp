@@ -75,6 +75,8 @@ class SessionRun {
         return _session.states(line.userInfo);
       case Operation::displayURL:
         return _session.displayURL();
+      case Operation::uploadFile:
+        return _session.uploadFile(line.path);
       case Operation::uploadLogData:
         return _session.uploadLogData(line.data);
       case Operation::finish:

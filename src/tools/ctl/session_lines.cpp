@@ -9,11 +9,11 @@
 namespace veltrad::ctl {
 namespace {
 
-constexpr Operation kOperations[] = {Operation::send,       Operation::flush,         Operation::states,
-                                     Operation::displayURL, Operation::uploadLogData, Operation::restart,
-                                     Operation::sleep,      Operation::finish};
+constexpr Operation kOperations[] = {Operation::send,       Operation::flush,      Operation::states,
+                                     Operation::displayURL, Operation::uploadFile, Operation::uploadLogData,
+                                     Operation::restart,    Operation::sleep,      Operation::finish};
 constexpr const char* kExpectedOperations =
-    "expected one of send, flush, states, displayURL, uploadLogData, restart, sleep, finish";
+    "expected one of send, flush, states, displayURL, uploadFile, uploadLogData, restart, sleep, finish";
 
 // What is wrong with the field; nothing when it is absent or an object.
 std::optional<std::string> objectProblem(Operation operation, const Dictionary& line, const char* key) {
@@ -45,6 +45,20 @@ Result<SessionLine, std::string> parseStates(const Dictionary& line) {
   SessionLine result;
   result.operation = Operation::states;
   if (const Dictionary* userInfo = line.dictionary("userInfo")) result.userInfo = *userInfo;
+  return result;
+}
+
+Result<SessionLine, std::string> parseUploadFile(const Dictionary& line) {
+  const Value* path = line.find("path");
+  if (!path) return Failure{std::string("no \"path\" in uploadFile: expected a text")};
+  const std::string* text = path->asString();
+  if (!text)
+    return Failure{fmt::format("\"path\" of uploadFile: expected a text, found {}", typeName(*path))};
+  if (text->find('\0') != std::string::npos)
+    return Failure{std::string("\"path\" of uploadFile holds a NUL character: expected none")};
+  SessionLine result;
+  result.operation = Operation::uploadFile;
+  result.path = *text;
   return result;
 }
 
@@ -113,6 +127,8 @@ Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
       return parseSend(*fields);
     case Operation::states:
       return parseStates(*fields);
+    case Operation::uploadFile:
+      return parseUploadFile(*fields);
     case Operation::uploadLogData:
       return parseUploadLogData(*fields);
     case Operation::sleep:

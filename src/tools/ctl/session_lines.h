@@ -20,6 +20,7 @@ struct SessionLine {
   Operation operation = Operation::flush;  // never start
   Dictionary message;                      // send: the line without "op"
   std::optional<Dictionary> userInfo;      // states
+  std::string path;                        // uploadFile
   Array data;                              // uploadLogData
   std::chrono::milliseconds duration{0};   // sleep
 };
