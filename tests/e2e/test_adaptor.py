@@ -2,6 +2,7 @@
 import json
 import os
 import shutil
+from pathlib import Path
 
 from harness import BUILD, Root, SystemTest, closed_port, wait_until
 
@@ -9,6 +10,7 @@ BUNDLE = ("System/Library/PrivateFrameworks/PellmarchServices.framework/Framewor
           "PellmarchPerformance.so")
 DEAF = "MivoBackend(sendMessage): Mivo adaptor {} does not respond to forwarding selector " \
        "sendMessageWithMethod:respCode:dict:"
+GOOD = BUILD / "lib/example_adaptor.so"
 NONE = "MivoBackend(initWithName): no Mivo adaptor: "
 THREW = "threw: no message today"
 
@@ -21,10 +23,6 @@ class Adaptor(SystemTest):
         self.addCleanup(os.umask, os.umask(0o022))
         self.file = self.root.path / BUNDLE
         self.file.parent.mkdir(parents=True)
-
-    def install(self, name):
-        self.file.unlink(missing_ok=True)
-        shutil.copy(BUILD / "lib" / f"{name}.so", self.file)
 
     def messages(self):
         path = self.root.path / "var/log/veltrad/example-adaptor.jsonl"
@@ -42,7 +40,7 @@ class Adaptor(SystemTest):
         self.assertEqual(session.close(), 0)
 
     def test_messages_as_they_are(self):
-        self.install("example_adaptor")
+        shutil.copy(GOOD, self.file)
         payload = {"codec": "opus \u00fc\n\"\\", "seconds": 12.5, "lost": -3, "most": 2**64 - 1, "video": False,
                    "start": {"$date": 1.5e9}, "key": {"$data": "AP/+AQ=="}, "": [1, [], {"deep": {"er": ["x"]}}]}
         with self.serving() as daemon:
@@ -59,59 +57,45 @@ class Adaptor(SystemTest):
                 {"method": client_type, "respCode": 0, "dict": None})])
 
     def test_what_cannot_be_loaded_is_tried_again(self):
-        def missing():
-            self.file.unlink(missing_ok=True)
-
-        def no_code():
-            self.file.write_text("a text")
-
-        def writable():
-            self.install("example_adaptor")
-            self.file.chmod(0o775)
-
-        def writable_directory():
-            self.install("example_adaptor")
-            self.file.parent.chmod(0o777)
-
-        def foreign():
-            self.file.parent.chmod(0o755)
-            os.chown(self.file, 12345, -1)
-
         theirs = "expected the file and every directory above it to be owned by root or the daemon's own user"
-        table = [(missing, "No such file or directory"), (no_code, "file too short"), (writable, theirs),
-                 (writable_directory, theirs)] + ([(foreign, theirs)] if os.getuid() == 0 else [])
+        table = [(None, 0, 0o755, 0, "No such file or directory"), (os.devnull, 0o644, 0o755, 0, "file too short"),
+                 (GOOD, 0o775, 0o755, 0, theirs), (GOOD, 0o755, 0o777, 0, theirs)]
+        if os.getuid() == 0:
+            table.append((GOOD, 0o755, 0o755, 12345, theirs))
         with self.serving(NONE, DEAF.format("(null)")) as daemon:
-            for spoil, reason in table:
-                with self.subTest(spoil.__name__):
+            for source, mode, directory_mode, owner, reason in table:
+                with self.subTest(source=source, mode=oct(mode), owner=owner):
                     before = len(daemon.text)
-                    spoil()
+                    if source:
+                        self.file.write_bytes(Path(source).read_bytes())
+                        self.file.chmod(mode)
+                    if owner:
+                        os.chown(self.file, owner, -1)
+                    self.file.parent.chmod(directory_mode)
                     self.is_deaf(daemon, DEAF.format("(null)"))
                     said, = (line for line in daemon.text[before:] if NONE in line)
                     self.assertIn(reason, said)
             self.assertEqual(self.messages(), [])
-            self.file.parent.chmod(0o755)
-            self.install("example_adaptor")
+            self.file.unlink()
+            shutil.copy(GOOD, self.file)
             self.assertEqual(self.open()[1], ["mivo"])
             wait_until(self.messages, "the start message")
 
     def test_faulty(self):
-        deaf = DEAF.format("(null)")
-        for fault, lines, line in (("otherVersion", ("an adaptor of version 2, expected 1",), deaf),
-                                   ("otherClass", ("no class MivoAdaptor among its 1",), deaf),
-                                   ("noInstance", ("MivoAdaptor has made no instance",), deaf),
-                                   ("throwsAtCreation", ("MivoAdaptor threw: no creation today",), deaf),
-                                   ("noOperation", ("sendMessage): Mivo adaptor <MivoAdaptor: 0x",),
-                                    DEAF.partition("{}")[2]),
-                                   ("throws", ("an exception without a text",), THREW)):
-            with self.subTest(fault):
-                self.install("adaptor_" + fault)
-                with self.serving(NONE, DEAF.partition("{}")[2], THREW, "an exception without a text") as daemon:
-                    self.is_deaf(daemon, line)
-                    for text in lines:
-                        daemon.wait_for_line(text)
+        deaf, unanswering, thrown = DEAF.format("(null)"), DEAF.partition("{}")[2], "an exception without a text"
+        for fault, reason, line in (("otherVersion", "an adaptor of version 2, expected 1", deaf),
+                                    ("otherClass", "no class MivoAdaptor among its 1", deaf),
+                                    ("noInstance", "MivoAdaptor has made no instance", deaf),
+                                    ("throwsAtCreation", "MivoAdaptor threw: no creation today", deaf),
+                                    ("noOperation", "Mivo adaptor <MivoAdaptor: 0x", unanswering),
+                                    ("throws", thrown, THREW)):
+            with self.subTest(fault), self.serving(NONE, unanswering, THREW, thrown) as daemon:
+                shutil.copy(BUILD / f"lib/adaptor_{fault}.so", self.file)
+                self.is_deaf(daemon, line)
+                daemon.wait_for_line(reason)
 
     def test_device_without_adaptor(self):
-        self.install("example_adaptor")
+        shutil.copy(GOOD, self.file)
         self.root.write("etc/veltrad/device.plist", {"ProductType": "Halvorn", "UniqueDeviceID": "ab" * 20})
         unknown = "VeltraBackend(newBackendWithName): mivo"
         with self.serving(unknown) as daemon:

@@ -80,7 +80,7 @@ class Energy(SystemTest):
             session.send(who=3)
             daemon.wait_for_line("The energy log is written again after 3 lost events")
             self.file.rename(self.directory / "energy.jsonl.1")
-            victim = self.root.path / "victim"
+            victim = self.directory / "victim"  # where the daemon may write
             victim.write_text("kept")
             self.file.symlink_to(victim)
             session.send(who=4)
