@@ -111,4 +111,5 @@ def main():
         root.remove()
 
 
-main()
+if __name__ == "__main__":
+    main()

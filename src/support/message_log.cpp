@@ -4,12 +4,10 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
 #include <cmath>
 #include <cstring>
 #include <ctime>
@@ -23,50 +21,9 @@ namespace veltrad {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
-constexpr std::string_view kPrefix = "veltrad_";
-constexpr std::string_view kSuffix = "_messageLog.diag";
-
-// The part between the underscores of a name that is one of the daemon's log files.
-std::optional<std::string_view> secondsInName(std::string_view name) {
-  if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix) ||
-      name.size() < kPrefix.size() + kSuffix.size()) {
-    return std::nullopt;
-  }
-  name.remove_prefix(kPrefix.size());
-  name.remove_suffix(kSuffix.size());
-  if (name.find('_') != std::string_view::npos) return std::nullopt;
-  return name;
-}
-
-// Of the birth time and the modification time the earlier; without a birth time the seconds in the name.
-std::optional<double> creationDate(const std::string& path) {
-  struct statx facts {};
-  if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &facts) != 0)
-    return std::nullopt;
-  const auto seconds = [](const struct statx_timestamp& time) {
-    return static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9;
-  };
-  if ((facts.stx_mask & STATX_BTIME) != 0)
-    return std::min(seconds(facts.stx_btime), seconds(facts.stx_mtime));
-  const auto digits = secondsInName(std::string_view(path).substr(path.rfind('/') + 1));
-  long long number = 0;
-  if (!digits || std::from_chars(digits->data(), digits->data() + digits->size(), number).ec != std::errc()) {
-    return std::nullopt;
-  }
-  return static_cast<double>(number);
-}
 
 std::string createdText(const std::optional<double>& created) {
   return created ? dateDescription(*created) : "(null)";
-}
-
-// One write at the end of the file. False when anything failed. A pipe in its place does not hold us up.
-bool append(const std::string& path, const std::string& line) {
-  const int file = open(path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
-  if (file < 0) return false;
-  const ssize_t written = write(file, line.data(), line.size());
-  const bool closed = close(file) == 0;
-  return closed && written == static_cast<ssize_t>(line.size());
 }
 }  // namespace
 
@@ -97,17 +54,33 @@ MessageLogFile::MessageLogFile(const platform::Clock& clock, std::string directo
     : _clock(clock), _directory(std::move(directory)) {}
 
 void MessageLogFile::writeToLogFile(std::string_view format, std::initializer_list<std::string_view> values) {
+  const double now = platform::timevalToSeconds(_clock.now());
+  const std::string line = fmt::format("({}) {}\n", dateDescription(now), filledFormat(format, values));
   const Lock held(_mutex);
-  auto file = newestSurvivor();
-  if (!file) file = createFile();
-  if (!file) return;
-  const std::string line = fmt::format("({}) {}\n", dateDescription(platform::timevalToSeconds(_clock.now())),
-                                       filledFormat(format, values));
-  if (!append(file->path, line)) {
-    remove(*file);
+  if (!currentFileIsOpen(now) && !openCurrentFile()) return;
+  if (!_current.append(line)) {
+    remove({_current.path(), _current.created()});
+    _current.close();
     return;
   }
-  logInfo("writeToLogFile: Saved log message to %s", file->path.c_str());
+  logInfo("writeToLogFile: Saved log message to %s", _current.path().c_str());
+}
+
+bool MessageLogFile::currentFileIsOpen(double now) const {
+  if (!_current.isCurrent(_directory)) return false;
+  const auto created = _current.created();
+  return created && now - *created <= kExpirySeconds;
+}
+
+bool MessageLogFile::openCurrentFile() {
+  _current.close();
+  const auto listed = DirectoryState::of(_directory);
+  auto file = newestSurvivor();
+  if (!file) file = createFile();
+  if (!file) return false;
+  if (_current.open(file->path, listed)) return true;
+  remove(*file);
+  return false;
 }
 
 std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
@@ -123,7 +96,7 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
   }
   std::vector<std::string> names;
   while (const dirent* entry = readdir(listing)) {
-    if (secondsInName(entry->d_name)) names.emplace_back(entry->d_name);
+    if (secondsInLogFileName(entry->d_name)) names.emplace_back(entry->d_name);
   }
   closedir(listing);
   std::sort(names.begin(), names.end());
@@ -132,7 +105,7 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
   std::optional<LogFile> newest;
   for (const std::string& name : names) {
     LogFile file{_directory + "/" + name, std::nullopt};
-    file.created = creationDate(file.path);
+    file.created = creationDate(AT_FDCWD, file.path);
     if (file.created && now - *file.created > kExpirySeconds) {
       remove(file);
     } else if (newest && newest->created) {
@@ -147,14 +120,14 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
 }
 
 std::optional<MessageLogFile::LogFile> MessageLogFile::createFile() {
-  LogFile file{fmt::format("{}/{}{}{}", _directory, kPrefix, _clock.now().seconds, kSuffix), std::nullopt};
+  LogFile file{fmt::format("{}/veltrad_{}_messageLog.diag", _directory, _clock.now().seconds), std::nullopt};
   const int made = open(file.path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
   if (made < 0) {
     logError("writeToLogFile: Failed to create new veltrad log file %s", file.path.c_str());
     return std::nullopt;
   }
   close(made);
-  file.created = creationDate(file.path);
+  file.created = creationDate(AT_FDCWD, file.path);
   logInfo("writeToLogFile: Created new veltrad log file %s (%s)", file.path.c_str(),
           createdText(file.created).c_str());
   return file;

@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "base/mutex.h"
+#include "support/open_log_file.h"
 
 namespace veltrad {
 
@@ -22,7 +23,8 @@ class MessageLog {
 };
 
 // In a directory of its own, files "veltrad_SECONDS_messageLog.diag", one of them current and at most a day
-// old. The directory is the only state; the lock covers the whole operation.
+// old. The directory is the only state: the current file is held open only while no name came to the
+// directory or went from it. The lock covers the whole operation.
 class MessageLogFile final : public MessageLog {
  public:
   // The clock outlives it. The directory is made by the first message.
@@ -34,6 +36,8 @@ class MessageLogFile final : public MessageLog {
     std::string path;
     std::optional<double> created;  // seconds since 1970
   };
+  bool currentFileIsOpen(double now) const REQUIRES(_mutex);
+  bool openCurrentFile() REQUIRES(_mutex);
   std::optional<LogFile> newestSurvivor() REQUIRES(_mutex);
   std::optional<LogFile> createFile() REQUIRES(_mutex);
   void remove(const LogFile& file) REQUIRES(_mutex);
@@ -43,6 +47,7 @@ class MessageLogFile final : public MessageLog {
   const std::string _directory;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  OpenLogFile _current GUARDED_BY(_mutex);
 };
 
 // "%@" by "%@". Exposed for its table of tests.

@@ -70,6 +70,32 @@ TEST_F(MessageLogTest, KeepsTheYoungestFileOfADay) {
   }
 }
 
+// Once the directory has settled the file is held open; whatever happens to it from outside is still seen.
+TEST_F(MessageLogTest, AHeldFileIsTheCurrentOneOnlyAsLongAsAListingWouldFindIt) {
+  const std::function<void()> fromOutside[] = {
+      [&] { std::filesystem::remove(_current); },
+      [&] { std::filesystem::rename(_current, _place.path("put aside")); },
+      [&] {
+        const timespec times[] = {{_now - 90'000, 0}, {_now - 90'000, 0}};
+        ASSERT_EQ(::utimensat(AT_FDCWD, _current.c_str(), times, 0), 0);
+      },
+      [&] {
+        std::filesystem::remove_all(_place.path());
+        std::filesystem::create_directory(_place.path());
+      }};
+  for (const auto& change : fromOutside) {
+    write();
+    while (!DirectoryState::of(_place.path())->settled) std::this_thread::yield();
+    write();
+    write();
+    EXPECT_EQ(_place.read(nameAt(_now)), _line + _line + _line);
+    change();
+    write();
+    EXPECT_EQ(_place.read(nameAt(_now)), _line);
+    std::filesystem::remove(_current);
+  }
+}
+
 TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) {
   _place.write("elsewhere", "foreign");
   rlimit before{};

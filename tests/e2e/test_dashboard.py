@@ -1,0 +1,133 @@
+"""The dashboard: datagrams, acknowledgements that are lost or wrong, a server that is not there, the end."""
+import collections
+import json
+import pathlib
+import socket
+
+from harness import DEADLINE, closed_port, wait_until
+from test_https import HTTPSTest, entry
+
+PERIOD = 250  # ms
+TICKS = (2, 5, 10, 19)  # of the transmissions after the first
+
+
+class Dashboard(HTTPSTest):
+    def section(self, port="${dashboardPort}", **more):
+        return {"ip": "127.0.0.1", "port": port, "display_url": "https://dash.example/1", **more}
+
+    def report_to(self, *entries, **section):
+        backends = {"dashboard": self.section(**section)}
+        if entries:
+            backends["httppost"] = {"clients": list(entries)}
+        self.lab.put("quindle", {"version": "v", "release": backends})
+
+    def dashboard(self, count, **like):
+        def found():
+            lines = [line for line in self.lab.received("dashboard")
+                     if all(line.get(key) == value for key, value in like.items())]
+            return lines if len(lines) >= count else None
+        return wait_until(found, f"{count} datagrams like {like}")
+
+    def test_every_event_arrives_though_acknowledgements_are_lost(self):
+        self.report_to(reliable=PERIOD)
+        self.lab.control(path="/dashboard", share=30, ack="drop")
+        with self.serving():
+            client, sent = self.client(), 40
+            for number in range(sent):
+                client.message(number=number)
+
+            def settled():
+                lines = self.dashboard(sent, method=5)
+                done = {line["eventID"] for line in lines if line["outcome"] == "acknowledged"}
+                return lines if len(done) == sent else None
+            lines = wait_until(settled, "an acknowledgement of each")
+            client.close()
+        arrivals = collections.defaultdict(list)
+        for line in lines:
+            arrivals[line["payload"]["number"]].append(line["time"])
+        self.assertEqual(sorted(map(int, arrivals)), list(range(sent)))
+        self.assertGreater(len(lines), sent)
+        for times in arrivals.values():
+            # The first tick after the first transmission may come at once; the timer's leeway is 100 ms.
+            for tick, time in zip(TICKS, times[1:]):
+                self.assertGreater(time - times[0], (tick - 1) * PERIOD / 1000 - 0.05)
+                self.assertLess(time - times[0], tick * PERIOD / 1000 + 2)
+            self.assertLessEqual(len(times), 5)
+
+    def test_a_datagram_that_nobody_acknowledges_is_given_up(self):
+        self.report_to(reliable=20)
+        self.lab.control(path="/dashboard", ack="drop")
+        with self.serving():
+            client = self.client()
+            client.message(number=1)
+            wait_until(lambda: self.stats().get("datagram given up: never acknowledged", 0) >= 2, "given up")
+            self.assertEqual(len(self.dashboard(5, method=5)), 5)
+            self.lab.reset()
+            client.close()
+
+    # What the dashboard does to one acknowledgement, how often that event then arrives, what is counted.
+    WRONG = [({"ack": "duplicate"}, 1, "no such datagram waits"), ({"ack": "short"}, 2, "shorter than 62 bytes"),
+             ({"ack": "long"}, 1, None), ({"ack": "foreign"}, 2, "no such datagram waits"),
+             ({"ack": "stranger"}, 2, None), ({"delayMs": 100}, 1, None)]
+
+    def test_wrong_acknowledgements(self):
+        self.report_to(reliable=PERIOD)
+        with self.serving():
+            client = self.client()
+            for number, (mood, arrives, counted) in enumerate(self.WRONG):
+                with self.subTest(mood):
+                    self.dashboard(1, method=0, outcome="acknowledged")
+                    before = self.stats().get(f"acknowledgement ignored: {counted}", 0)
+                    self.lab.control(path="/dashboard", times=1, **mood)
+                    client.message(case=number)
+                    self.assertEqual(len(self.dashboard(arrives, payload={"case": str(number)})), arrives)
+                    if counted:
+                        wait_until(lambda: self.stats().get(f"acknowledgement ignored: {counted}", 0) > before, counted)
+            client.close()
+
+    def test_a_server_that_comes_late(self):
+        port = closed_port()
+        self.report_to(port=port)
+        with self.serving(), socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as server:
+            client = self.client()
+            for number in range(80):  # each refusal fails the next send, which is held and tried again
+                client.message(number=number)
+            server.bind(("127.0.0.1", port))
+            server.settimeout(DEADLINE)
+            self.assertIn(b" number=", server.recv(4096))
+            client.message(number="last")
+            wait_until(lambda: b" number=last" in server.recv(4096), "the last message")
+            client.close()
+            wait_until(lambda: b"StorebagVersion" in server.recv(4096), "the stop message")
+        self.assertGreater(self.counts()["datagram held: the socket did not take it"], 10)
+
+    def test_both_reports_of_one_call(self):
+        self.report_to(entry(), reliable=PERIOD)
+        with self.serving():
+            client = self.client()
+            self.assertEqual(client.backends, ["dashboard", "httppost"])
+            self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "https://dash.example/1")
+            posted = json.loads(client.message(b="long value", a=1))  # the post's answer comes first
+            line = self.dashboard(1, method=5)[0]
+            self.assertEqual((line["text"], line["eventID"], line["reliable"], line["deviceID"]),
+                             (" a=1 b=long value", posted["events"][0]["_eventNumber"], True, "ab" * 20))
+            self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+            quiet = self.client()
+            self.assertRegex(quiet.message(a=1), rf"^\d+\.\d{{3}} {'ab' * 20} 127.0.0.1 \w\w +0 +{quiet.number} +2 +5 +2  a=1$")
+            client.close(), quiet.close()
+        log = "".join(path.read_text() for path in pathlib.Path(self.root.path).glob("var/mobile/**/*.diag"))
+        self.assertIn("[dashboard -> sendMessageWithDictionary] ", log)
+
+    def test_the_end_waits_for_acknowledgements_but_not_for_ever(self):
+        self.report_to(reliable=PERIOD)
+        daemon = self.daemon()
+        client = self.client()
+        self.lab.control(path="/dashboard", ack="drop")
+        client.message(number=1)
+        self.assertLess(daemon.stop(), 10)
+        counts = self.counts()
+        # Start, message, stop: each was acknowledged, given up or said to be lost.
+        self.assertEqual(counts["datagram sent"], 3)
+        ended = "datagram acknowledged", "datagram given up: never acknowledged", \
+            "datagram given up: not acknowledged before its back end ended"
+        self.assertEqual(sum(counts.get(how, 0) for how in ended), 3)
