@@ -1,5 +1,5 @@
-"""One call: publishes examples/storebag.json, plays examples/call.jsonl and examples/lamp.jsonl, and shows both ends of the
-road."""
+"""One call, reported to the collector and to the dashboard: publishes examples/storebag.json, plays examples/call.jsonl and
+examples/lamp.jsonl, and shows both ends of the road."""
 import collections
 import contextlib
 import json
@@ -26,6 +26,10 @@ def kind(event):
     return event["_method"], event["_status"]
 
 
+def short(text, length):
+    return text if len(text) <= length else text[:length - 1] + "…"
+
+
 def posted(reply):
     """The events in a reply: one text of JSON, or two with words before them."""
     texts = re.split(r"^(?:Flushed events|Standalone event):$", reply, flags=re.M)
@@ -40,6 +44,8 @@ def show_answers(output):
             events = posted(reply)
             answer = f"{len(events)} event{'s'[:len(events) - 1]} posted, number {events[0]['_eventNumber']}"
             answer += f" to {events[-1]['_eventNumber']}" if len(events) > 1 else ""
+        elif isinstance(reply, str) and " 127.0.0.1 " in reply:
+            answer = "the dashboard's line: " + short("… " + reply.split(" 127.0.0.1 ")[1], 80)
         print(f"  {operation:<11} {answer if isinstance(answer, str) else json.dumps(answer)}")
 
 
@@ -54,7 +60,7 @@ def play(root, name, session):
 
 def line_of(event):
     own = {"eventTime", "clientName", "serviceName"}
-    fields = [f"{key}={value if len(str(value)) <= 24 else str(value)[:12] + '…'}" for key, value in event.items()
+    fields = [f"{key}={short(str(value), 24)}" for key, value in event.items()
               if key[0] != "_" and key not in own]
     return f"{event['_eventNumber']:>3}  {event['_method']:>2}/{event['_status']:<3} {' '.join(fields)}"
 
@@ -76,7 +82,7 @@ def show_message_log(root):
         entries = re.split(r"^(?=\(\d{4}-)", path.read_text(), flags=re.M)[1:]
         for entry in entries:
             first, *rest = entry.splitlines()
-            print(f"  {first} … and {len(rest)} lines")
+            print(f"  {short(first, 110)}{f' … and {len(rest)} lines' if rest else ''}")
 
 
 def check(posts):
@@ -93,6 +99,23 @@ def check(posts):
     return problems
 
 
+def datagrams(lab):
+    return {(line["sessionID"], line["eventID"]): line for line in lab.received("dashboard")}
+
+
+def check_dashboard(lab):
+    with contextlib.suppress(AssertionError):
+        wait_until(lambda: len(datagrams(lab)) >= taken(), "the dashboard's datagrams")
+    heard = len(datagrams(lab))
+    return [f"the dashboard heard of {heard} messages of {taken()}"] if heard != taken() else []
+
+
+def show_dashboard(lab):
+    heading("What the dashboard heard over UDP, in the clear: number, category/type, the text; each was acknowledged")
+    for (session, number), line in sorted(datagrams(lab).items()):
+        print(f"  session {session} {number:>3}  {line['method']:>2}/{line['respCode']:<3}{short(line['text'], 80)}")
+
+
 def taken():
     """How many messages the daemon takes in."""
     return messages("call.jsonl").total() + messages("lamp.jsonl").total()
@@ -106,7 +129,7 @@ def show(root, lab, daemon):
     lamp = play(root, "lamp.jsonl", LAMP)
     heading("What the phone was answered, which lets its events be batched")
     show_answers(answers)
-    heading("What the lamp was answered, which is sampled out")
+    heading("What the lamp was answered, which is sampled out at the collector")
     show_answers(lamp)
     expected = messages("call.jsonl").total()
     with contextlib.suppress(AssertionError):  # then check() says which are missing
@@ -114,10 +137,11 @@ def show(root, lab, daemon):
     daemon.wait_for_line("dealloc: VeltradSession dealloc: 43")
     posts = lab.received("events")
     show_posts(posts)
+    problems = check(posts) + check_dashboard(lab)
+    show_dashboard(lab)
     show_message_log(root)
-    problems = check(posts)
-    if json.loads(lamp.splitlines()[0])["backends"] != []:
-        problems.append("the lamp was told that something reports")
+    if json.loads(lamp.splitlines()[0])["backends"] != ["dashboard"]:
+        problems.append("the lamp was told that something but the dashboard reports")
     if not problems:
-        heading(f"{expected} of {expected} events arrived, none of the lamp's")
+        heading(f"{expected} of {expected} events arrived, none of the lamp's; the dashboard heard of {taken()} messages")
     return problems
