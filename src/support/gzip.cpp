@@ -58,7 +58,8 @@ bool deflateAll(const ByteSource& source, std::string& output, std::size_t& take
 
 std::optional<std::string> deflateSource(const ByteSource& source, std::size_t expected) {
   std::string output;
-  output.reserve(compressBound(expected));  // only what is written to costs memory
+  // Only what is written to costs memory, so there is room to spare for blocks that end early.
+  output.reserve(compressBound(expected) + expected / 256);
   std::size_t taken = 0;
   const bool done =
       expected < kBytesForLanes ? deflateAll(source, output, taken) : GzipLanes(source, output).run(taken);

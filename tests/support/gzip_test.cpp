@@ -45,5 +45,36 @@ TEST(Gzip, GivesBackWhatWentIn) {
   log.expectLine(platform::LogLevel::debug, "compressDataWithZlibOrGzip: Compressed file from 1 to ");
 }
 
+// Piece by piece: the same bytes up to a size, one stream by two threads beyond it.
+TEST(Gzip, OfASourceIsOneStream) {
+  RecordedLog log;
+  std::mt19937 random(11);
+  std::string large(5u << 20, '\0');  // ten blocks and an empty one
+  for (char& c : large) c = "0123456789abcdef\n "[random() % 18];
+  const auto packed = [](std::string_view rest, std::size_t piece, std::size_t failingAt = 0) {
+    const std::size_t size = rest.size();
+    const ByteSource source = [=](char* place, std::size_t room) mutable -> std::optional<std::size_t> {
+      if (failingAt > 0 && rest.size() <= size - failingAt) return std::nullopt;
+      const std::size_t count = rest.copy(place, std::min(room, piece));
+      rest.remove_prefix(count);
+      return count;
+    };
+    return gzipDeflate(source, size);
+  };
+  const std::string_view small = std::string_view(large).substr(0, 1'000'000);
+  EXPECT_EQ(packed(small, 12'345), gzipDeflate(small));
+  for (const std::size_t size : {large.size(), large.size() - 1}) {
+    const std::string_view input = std::string_view(large).substr(0, size);
+    const auto stream = packed(input, 99'999);
+    ASSERT_TRUE(stream);
+    EXPECT_TRUE(inflated(*stream, size, 31) == input);
+    EXPECT_EQ(stream->substr(0, 10), gzipDeflate("x")->substr(0, 10));
+    EXPECT_LT(stream->size(), gzipDeflate(input)->size() * 101 / 100);
+  }
+  EXPECT_FALSE(packed(large, 99'999, 3u << 20) || packed(small, 99'999, 500'000));
+  EXPECT_FALSE(packed("", 1));
+  log.expectLine(platform::LogLevel::error, "compressDataWithZlibOrGzip: Cannot compress empty Torvane");
+}
+
 }  // namespace
 }  // namespace veltrad

@@ -87,7 +87,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
 }
 
 std::optional<std::string> UploadBackend::compressed(FileSnapshot& file, const std::string& path) const {
-  return gzipDeflate([&](char* bytes, std::size_t room) -> std::optional<std::size_t> {
+  const auto next = [&](char* bytes, std::size_t room) -> std::optional<std::size_t> {
     if (_http.stopping()) {
       logError("UploadBackend(uploadFileAtPath): The daemon is stopping");
       return std::nullopt;
@@ -98,7 +98,8 @@ std::optional<std::string> UploadBackend::compressed(FileSnapshot& file, const s
                std::strerror(errno));
     }
     return count;
-  });
+  };
+  return gzipDeflate(next, static_cast<std::size_t>(file.size()));
 }
 
 bool UploadBackend::confirms(const std::string& url, const platform::HTTPResult& answer) const {
