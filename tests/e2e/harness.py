@@ -31,12 +31,12 @@ def program(name):
     return str(BUILD / "bin" / name)
 
 
-def wait_until(condition, what, deadline=DEADLINE):
-    """The first true value of condition(), asked again until the deadline."""
+def wait_until(condition, what, deadline=DEADLINE, also=lambda: ""):
+    """The first true value of condition(), asked again until the deadline; `also` is said where none came."""
     end = time.monotonic() + deadline
     while not (value := condition()):
         if time.monotonic() > end:
-            raise AssertionError(f"not within {deadline} s: {what}")
+            raise AssertionError(f"not within {deadline} s: {what} {also()}")
         time.sleep(0.01)
     return value
 
