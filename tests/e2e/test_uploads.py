@@ -1,0 +1,203 @@
+"""Files from a client to the upload server: what is uploaded, what the answer means, and what becomes of the file."""
+import hashlib
+import json
+import os
+import socket
+import subprocess
+
+from harness import DEVICE, SystemTest, Wire, closed_port, program, storebag, wait_until
+
+OP = "uploadFileAtPath:extensionToken:completionHandler:"
+REGULAR, EMPTY = "Only upload a regular file.", "Input file is empty"
+CHANGED = "has changed since its upload began, so it stays"
+
+
+class Uploads(SystemTest):
+    def setUp(self):
+        super().setUp()
+        self.serve_at("${url}/upload")
+        self.files = self.root.path / "files"
+        self.files.mkdir()
+
+    def serve_at(self, url):
+        self.lab.put("quindle", storebag(backends={"uploadserver": {"post_url": url}}))
+
+    def make(self, name="a b.log", content=b"some lines\n" * 300):
+        path = os.path.join(os.fsencode(self.files), os.fsencode(name))
+        with open(path, "wb") as file:
+            file.write(content)
+        return path
+
+    def upload(self, path, status=0):
+        out, said = self.ctl("upload", "--client-type", "7", "--session-id", "9", path, status=status)
+        return json.loads(out), said
+
+    def lend(self, wire, descriptor, path="/x/lent.log"):
+        """The frames that answer an upload with this descriptor (none: -1), an event before the reply."""
+        self.call = getattr(self, "call", 1000) + 1
+        wire.send(Wire.CALL, {"op": OP, "args": {"path": path}}, self.call, *((1, [descriptor]) if descriptor >= 0 else ()))
+        frames = [wire.frame()]
+        while frames[-1][0] != Wire.REPLY:
+            frames.append(wire.frame())
+        return frames
+
+    def descriptors(self, process):
+        return len(os.listdir(f"/proc/{process.popen.pid}/fd"))
+
+    def test_request_and_its_file(self):
+        content = os.urandom(5 << 20)  # enough for two threads
+        names = ["a b.log", "50%&x=1#ü.txt", b"\xff.log", "-"]
+        with self.serving() as daemon:
+            for name in names:
+                path = self.make(name, content)
+                answer, said = self.upload(path)
+                self.assertEqual(answer, {"op": "uploadFile", "uploaded": True})
+                self.assertIn("Uploaded and removed", said)
+                self.assertFalse(os.path.lexists(path))
+            lines = self.lab.received("uploads", len(names))
+            daemon.wait_for_line("Json output: {\"success\": true}", len(names))
+        encoded = ["a%20b.log.gz", "50%25&x=1%23%C3%BC.txt.gz", "%EF%BF%BD.log.gz", "-.gz"]
+        for line, name in zip(lines, encoded):
+            self.assertEqual(line["path"], f"/upload?uuid={DEVICE['UniqueDeviceID']}&sequence=9&description=Callwyn%20QBSL"
+                             f"%20log%20(Uploaded%20by%20PKV)&filename={name}&raw=true")
+            self.assertEqual((line["method"], line["headers"]["Content-Type"], line["headers"]["Content-Encoding"]),
+                             ("POST", "application/octet-stream", "gzip"))
+            self.assertEqual(line["plainSHA256"], hashlib.sha256(content).hexdigest())
+        log = next((self.root.path / "var/mobile/Library/Logs/Zentrel/Retired").iterdir()).read_text()
+        self.assertIn(f"[uploadFileWithURL] Upload succeeded for file file://{self.files}/a%20b.log", log)
+
+    def test_files_that_are_refused(self):
+        real = self.make("real")
+        kinds = {
+            "missing": (lambda path: None, "cannot be opened: No such file", REGULAR),
+            "none/x": (lambda path: None, "cannot be opened: No such file", REGULAR),
+            "directory": (os.mkdir, "is a directory", REGULAR),
+            "directory/": (lambda path: None, "cannot be opened", REGULAR),
+            "link": (lambda path: os.symlink(real, path), "is a symbolic link", REGULAR),
+            "fifo": (os.mkfifo, "is a FIFO", REGULAR),
+            "socket": (lambda path: socket.socket(socket.AF_UNIX).bind(path), "is a socket", REGULAR),
+            "/dev/null": (lambda path: None, "is a device", REGULAR),
+            "empty": (lambda path: open(path, "w").close(), "is empty", EMPTY),
+            "large": (lambda path: os.truncate(self.make("large"), 1 << 31), "has 2147483648 bytes",
+                      "has 2147483648 bytes: at most 2147483647 are uploaded"),
+        }
+        with self.serving("Only upload", EMPTY, "at most 2147483647", "File upload failed") as daemon:
+            for name, (make, problem, line) in kinds.items():
+                with self.subTest(name):
+                    path = os.path.join(self.files, name)
+                    make(path)
+                    before = len(daemon.text)
+                    answer, said = self.upload(path, status=1)
+                    self.assertEqual(answer, {"op": "uploadFile", "uploaded": False})
+                    self.assertIn(f"Not uploaded: {path} {problem}", said)
+                    self.assertTrue([text for text in daemon.text[before:] if line in text])
+            daemon.wait_for_line("File upload failed for", len(kinds))
+        self.assertTrue(os.path.exists(real))
+        self.assertEqual(self.lab.received("uploads"), [])
+
+    def test_descriptors_of_a_bare_client(self):
+        """The path is a name and nothing more; what came is closed, whatever it was."""
+        path = self.make(content=b"lent")
+        secret = self.make("secret", b"of the daemon")
+        ends = os.pipe()
+        bad = {"none": -1, "pipe": ends[0], "directory": os.open(self.files, os.O_RDONLY),
+               "socket": socket.socket().detach(), "device": os.open("/dev/zero", os.O_RDONLY),
+               "unreadable": os.open(path, os.O_WRONLY), "path alone": os.open(path, os.O_PATH),
+               "of no size": os.open("/proc/self/status", os.O_RDONLY)}
+        good = os.open(path, os.O_RDONLY)
+        with self.serving("Only upload", EMPTY, "cannot be read: Bad file descriptor", "File upload failed") as daemon:
+            client = Wire(self.root)
+            client.describe()
+            client.call("startConfigWithCompletionHandler:")
+            confirm = [(Wire.EVENT, 0, {"op": "removeUploadedFile:", "args": {"call": 1001}}),
+                       (Wire.REPLY, 1001, {"results": {"uploaded": True}})]
+            self.assertEqual(self.lend(client, good, os.fsdecode(secret)), confirm)
+            before = self.descriptors(daemon)
+            for name, descriptor in bad.items():
+                with self.subTest(name):
+                    (_, _, reply), = self.lend(client, descriptor)
+                    self.assertEqual(reply, {"results": {"uploaded": False}})
+            client.send(Wire.CALL, {"op": OP, "args": {"path": "/y/silent"}}, 0, 1, [good])  # asks for no reply
+            self.assertEqual([frame[0] for frame in self.lend(client, good)], [Wire.EVENT, Wire.REPLY])
+            wait_until(lambda: self.descriptors(daemon) <= before, f"descriptors back to {before}")
+            daemon.wait_for_line(REGULAR, 5)
+            daemon.wait_for_line(EMPTY, 3)
+            uploads = self.lab.received("uploads", 3)
+        self.assertEqual([line["query"]["filename"] for line in uploads], ["secret.gz", "silent.gz", "lent.log.gz"])
+        self.assertEqual({line["plainSHA256"] for line in uploads}, {hashlib.sha256(b"lent").hexdigest()})
+        self.assertTrue(os.path.exists(path) and os.path.exists(secret))
+
+    def test_answers(self):
+        cases = [({"status": 500, "body": "no success today"}, True, "Json output: no success today"),
+                 ({"body": "stored"}, False, "Json output: stored"),
+                 ({"body": {"$data": "/3N1Y2Nlc3M="}}, False, "Json output: (undecodable)"),
+                 ({"body": ""}, False, "post (null)"),
+                 ({"cut": True}, False, "post Empty reply from server"),
+                 ({"cutHalfway": True}, False, "post ")]
+        with self.serving("post ") as daemon:
+            for rule, removed, line in cases:
+                with self.subTest(rule):
+                    self.lab.control(path="/upload", times=1, **rule)
+                    path = self.make()
+                    answer, said = self.upload(path)
+                    self.assertEqual(answer, {"op": "uploadFile", "uploaded": True})
+                    self.assertIn("and removed" if removed else "has not confirmed it", said)
+                    self.assertEqual(os.path.exists(path), not removed)
+                    daemon.wait_for_line("UploadBackend(uploadFileAtPath): " * line.startswith("post") + line)
+
+    def test_addresses(self):
+        for url, status, line in [(f"https://localhost:{closed_port()}/", 0, "post Failed to connect"),
+                                  ("https://localhost/a b", 1, "Unable to create URL request"),
+                                  ("", 1, "Unable to create URL request")]:
+            with self.subTest(url), self.serving(line, "File upload failed") as daemon:
+                self.serve_at(url)
+                self.upload(self.make(), status)
+                daemon.wait_for_line("UploadBackend(uploadFileAtPath): " + line)
+        self.lab.put("quindle", storebag(backends={"uploadserver": {"display_url": "https://x/"}}))
+        with self.serving("can't resolve upload post URL.", "File upload failed"):
+            self.assertIn("Nobody took", self.upload(self.make(), 1)[1])
+        self.assertEqual(os.listdir(self.files), ["a b.log"])
+
+    def test_files_that_change_before_the_answer(self):
+        changes = {
+            "grows": (lambda path: open(path, "ab").write(b"more"), CHANGED, None),
+            "shrinks": (lambda path: os.truncate(path, 5), CHANGED, None),
+            "rewritten": (lambda path: open(path, "r+b").write(b"SOME"), CHANGED, None),
+            "replaced": (lambda path: os.replace(self.make("other"), path), None, "another file has taken its place"),
+            "linked": (lambda path: (os.unlink(path), os.symlink("/etc/passwd", path)), None, "another file has taken"),
+            "gone": (os.unlink, None, "cannot be found any more: No such file"),
+        }
+        with self.serving(CHANGED) as daemon:
+            session, _ = self.open()
+            before = self.descriptors(session)
+            for count, (name, (change, line, problem)) in enumerate(changes.items(), 1):
+                with self.subTest(name):
+                    path = os.fsdecode(self.make(name))
+                    self.lab.control(path="/upload", stall=True)
+                    client = subprocess.Popen([program("veltractl"), "upload", "--client-type", "7", path],
+                                              env=self.root.environment(), stdout=subprocess.DEVNULL,
+                                              stderr=subprocess.PIPE)
+                    self.lab.received("uploads", count)
+                    change(path)
+                    self.lab.reset()
+                    said = client.communicate()[1].decode()
+                    self.assertEqual((client.returncode, "Uploaded and kept" in said), (0, True), said)
+                    self.assertIn(problem or "the file has changed", said)
+                    self.assertEqual(os.path.lexists(path), name != "gone")
+                    if line:
+                        daemon.wait_for_line(f"File {path} {line}")
+            self.assertEqual(session.ask("uploadFile", path=os.fsdecode(self.make("last"))), {"op": "uploadFile",
+                                                                                              "uploaded": True})
+            self.assertFalse((self.files / "last").exists())
+            self.assertEqual(self.descriptors(session), before)
+            self.assertEqual(session.close(), 0)
+
+    def test_a_stop_waits_for_no_upload(self):
+        with self.serving("The daemon is stopping", "File upload failed"):
+            self.lab.control(path="/upload", stall=True)
+            sessions = [self.open(session_id=number)[0] for number in range(4)]
+            for number, session in enumerate(sessions):
+                session.say(op="uploadFile", path=os.fsdecode(self.make(str(number))))
+            self.lab.received("uploads", 2)
+        self.assertEqual(sorted(session.answer()["uploaded"] for session in sessions), [False, False, True, True])
+        self.assertEqual(len(os.listdir(self.files)), 4)
