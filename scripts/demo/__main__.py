@@ -8,9 +8,10 @@ import threading
 
 import call
 import family
+import upload
 from stage import Daemon, Lab, Root, heading, program, wait_until
 
-ACTS = (call, family)
+ACTS = (call, family, upload)
 
 
 def show_stats(root):
