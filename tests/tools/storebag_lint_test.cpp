@@ -65,6 +65,9 @@ TEST(StorebagLint, LooksThroughWhatIsAroundThem) {
       {storebag("x"), R"(storebag: "release" is not a dictionary: counts as absent)"},
       {storebag(Dictionary{{"httpost", 1}}), R"(release: unknown back end "httpost": expected one of dash)"},
       {storebag(Dictionary{{"httppost2", Dictionary{}}}), R"(release.httppost2: no "clients": )"},
+      {storebag(Dictionary{{"uploadserver", Dictionary{}}}), R"(release.uploadserver: no "post_url": )"},
+      {storebag(Dictionary{{"uploadserver", Dictionary{{"post_url", "u.example"}}}}),
+       R"(release.uploadserver: "post_url" does not begin with https://: )"},
       {clients(Array{}), R"(release.httppost: "clients" is empty: refuses every client)"},
       {clients(Array{everyone, kGood}), "release.httppost.clients[1]: never used for a client that requires"},
   };

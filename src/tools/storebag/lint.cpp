@@ -30,6 +30,7 @@ constexpr Keys kBackends = {
     {kVeltraBackendHTTPPost, Kind::dictionary},  {kVeltraBackendHTTPPost2, Kind::dictionary},
     {kVeltraBackendAmpery, Kind::dictionary},    {kVeltraBackendMivo, Kind::dictionary}};
 constexpr Keys kHTTPSPostKeys = {{"clients", Kind::array}, {"display_url", Kind::text}};
+constexpr Keys kUploadKeys = {{"post_url", Kind::text}, {"display_url", Kind::text}};
 constexpr Keys kEntryKeys = {{"client", Kind::text},
                              {"service", Kind::text},
                              {"expedite", Kind::number},
@@ -150,6 +151,21 @@ class Lint {
     checkKeys(place, "back end", section, kBackends);
     for (const char* name : {kVeltraBackendHTTPPost, kVeltraBackendHTTPPost2})
       if (const Dictionary* profile = section.dictionary(name)) checkClients(place + "." + name, *profile);
+    if (const Dictionary* profile = section.dictionary(kVeltraBackendUploadServer))
+      checkUploads(place + "." + kVeltraBackendUploadServer, *profile);
+  }
+
+  void checkUploads(const std::string& place, const Dictionary& profile) {
+    checkKeys(place, "key", profile, kUploadKeys);
+    if (!profile.string("post_url")) say(place, "no \"post_url\": the back end is left out");
+    checkURL(place, profile, "post_url");
+  }
+
+  void checkURL(const std::string& place, const Dictionary& dictionary, const char* key) {
+    const std::string* url = dictionary.string(key);
+    if (url != nullptr && lowerCase(*url).rfind("https://", 0) != 0)
+      say(place,
+          fmt::format("\"{}\" does not begin with https://: nothing is posted to {}", key, quoted(*url)));
   }
 
   void checkClients(const std::string& place, const Dictionary& profile) {
@@ -178,12 +194,7 @@ class Lint {
     if (!entry.real("sampling_threshold") && (countries == nullptr || countries->empty()))
       say(place, fmt::format("no \"sampling_threshold\", not even for a country: {}", kNobody));
     if (!entry.string("post_url")) say(place, "no \"post_url\": nothing can be posted");
-    for (const char* key : {"post_url", "realtime_post_url"}) {
-      const std::string* url = entry.string(key);
-      if (url != nullptr && lowerCase(*url).rfind("https://", 0) != 0)
-        say(place,
-            fmt::format("\"{}\" does not begin with https://: nothing is posted to {}", key, quoted(*url)));
-    }
+    for (const char* key : {"post_url", "realtime_post_url"}) checkURL(place, entry, key);
     forEach(place + ".filters", entry.array("filters"),
             [this](const std::string& at, const Dictionary& filter) {
               checkKeys(at, "key", filter, kFilterKeys);
