@@ -81,17 +81,22 @@ class Uploads(SystemTest):
             "large": (lambda path: os.truncate(self.make("large"), 1 << 31), "has 2147483648 bytes",
                       "has 2147483648 bytes: at most 2147483647 are uploaded"),
         }
+        seen = []
         with self.serving("Only upload", EMPTY, "at most 2147483647", "File upload failed") as daemon:
             for name, (make, problem, line) in kinds.items():
                 with self.subTest(name):
                     path = os.path.join(self.files, name)
                     make(path)
-                    before = len(daemon.text)
                     answer, said = self.upload(path, status=1)
                     self.assertEqual(answer, {"op": "uploadFile", "uploaded": False})
                     self.assertIn(f"Not uploaded: {path} {problem}", said)
-                    self.assertTrue([text for text in daemon.text[before:] if line in text])
+                    seen.append(line)
+                    daemon.wait_for_line(line, seen.count(line))
             daemon.wait_for_line("File upload failed for", len(kinds))
+        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]  # of the run that has ended
+        self.assertEqual({key: count for key, count in counts.items() if "file " in key},
+                         {"file refused: nothing lent, or no regular file": 8, "file refused: too large": 1,
+                          "file refused: empty or unreadable": 1})
         self.assertTrue(os.path.exists(real))
         self.assertEqual(self.lab.received("uploads"), [])
 

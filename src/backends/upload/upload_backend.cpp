@@ -8,6 +8,7 @@
 #include "backends/upload/file_uploads.h"
 #include "backends/upload/upload_request.h"
 #include "base/text.h"
+#include "platform/counters.h"
 #include "platform/http_client.h"
 #include "platform/lent_files.h"
 #include "platform/log.h"
@@ -20,27 +21,8 @@ namespace {
 // What a server's answer holds where it has stored the file.
 constexpr std::string_view kConfirmation = "success";
 
-// Nothing: it cannot be uploaded, which has been said.
-std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) {
-  const auto file = FileSnapshot::of(lent ? lent->descriptor() : -1);
-  if (!file) {
-    logError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
-    return std::nullopt;
-  }
-  if (file->size() > FileSnapshot::kMostBytes) {
-    logError("UploadBackend(uploadFileAtPath): File %s has %lld bytes: at most %lld are uploaded",
-             path.c_str(), static_cast<long long>(file->size()),
-             static_cast<long long>(FileSnapshot::kMostBytes));
-    return std::nullopt;
-  }
-  const auto content = file->content();
-  if (content == FileSnapshot::Content::some) return file;
-  if (content == FileSnapshot::Content::unreadable) {
-    logError("UploadBackend(uploadFileAtPath): File %s cannot be read: %s", path.c_str(),
-             std::strerror(errno));
-  }
-  logError("UploadBackend(uploadFileAtPath): Input file is empty");
-  return std::nullopt;
+void sayUnreadable(const std::string& path, int error) {
+  logError("UploadBackend(uploadFileAtPath): File %s cannot be read: %s", path.c_str(), std::strerror(error));
 }
 
 }  // namespace
@@ -65,6 +47,7 @@ UploadBackend::UploadBackend(const BackendServices& services, FileUploads& uploa
     : VeltraBackend(name, profile, productFamily, services.random),
       _uploads(uploads),
       _http(services.http),
+      _counters(services.counters),
       _lentFiles(services.lentFiles) {}
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
@@ -82,8 +65,33 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
     return false;
   }
+  _counters.count("file uploaded");
   if (confirms(*url, _http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
+}
+
+// Nothing: it cannot be uploaded, which has been said and counted.
+std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile* lent,
+                                                        const std::string& path) const {
+  const auto file = FileSnapshot::of(lent ? lent->descriptor() : -1);
+  if (!file) {
+    logError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
+    _counters.count("file refused: nothing lent, or no regular file");
+    return std::nullopt;
+  }
+  if (file->size() > FileSnapshot::kMostBytes) {
+    logError("UploadBackend(uploadFileAtPath): File %s has %lld bytes: at most %lld are uploaded",
+             path.c_str(), static_cast<long long>(file->size()),
+             static_cast<long long>(FileSnapshot::kMostBytes));
+    _counters.count("file refused: too large");
+    return std::nullopt;
+  }
+  const auto content = file->content();
+  if (content == FileSnapshot::Content::some) return file;
+  if (content == FileSnapshot::Content::unreadable) sayUnreadable(path, errno);
+  logError("UploadBackend(uploadFileAtPath): Input file is empty");
+  _counters.count("file refused: empty or unreadable");
+  return std::nullopt;
 }
 
 std::optional<std::string> UploadBackend::compressed(FileSnapshot& file, const std::string& path) const {
@@ -93,10 +101,7 @@ std::optional<std::string> UploadBackend::compressed(FileSnapshot& file, const s
       return std::nullopt;
     }
     const auto count = file.read(bytes, room);
-    if (!count) {
-      logError("UploadBackend(uploadFileAtPath): File %s cannot be read: %s", path.c_str(),
-               std::strerror(errno));
-    }
+    if (!count) sayUnreadable(path, errno);
     return count;
   };
   return gzipDeflate(next, static_cast<std::size_t>(file.size()));
@@ -120,9 +125,11 @@ void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& f
   if (file.changed()) {
     logWarning("UploadBackend(uploadFileAtPath): File %s has changed since its upload began, so it stays",
                path.c_str());
+    _counters.count("file kept: it changed during its upload");
     return;
   }
   lent.askForRemoval();
+  _counters.count("file confirmed: its removal was asked for");
 }
 
 std::optional<std::string> UploadBackend::uploadURL() const {

@@ -8,11 +8,11 @@
 
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
+#include "backends/upload/file_snapshot.h"
 #include "platform/http_client.h"
 
 namespace veltrad {
 
-class FileSnapshot;
 class FileUploads;
 namespace platform {
 class LentFile;
@@ -41,6 +41,7 @@ class UploadBackend final : public VeltraBackend {
   UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
                 const Dictionary& profile, const std::string& productFamily);
 
+  std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   std::optional<std::string> compressed(FileSnapshot& file, const std::string& path) const;
   bool confirms(const std::string& url, const platform::HTTPResult& answer) const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
@@ -48,6 +49,7 @@ class UploadBackend final : public VeltraBackend {
   // Constant after construction.
   FileUploads& _uploads;
   platform::HTTPClient& _http;
+  platform::Counters& _counters;
   platform::LentFiles& _lentFiles;
 
   mutable Mutex _urlMutex BACKEND_LOCK{LockRank::backend};
