@@ -6,17 +6,56 @@
 #include <thread>
 
 #include "config/storebag_source.h"
-#include "fakes/fake_backends.h"
-#include "fakes/fake_connection.h"
-#include "fakes/fake_transaction.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
+#include "platform/transaction.h"
+#include "protocol/connection.h"
 #include "session/flush_counters.h"
 #include "support/message_log.h"
 
 namespace veltrad {
 
 namespace {
+
+// A connection without a socket: the test asks and ends it.
+struct FakeConnection final : Connection {
+  std::string description() const override { return "connection under test"; }
+  std::optional<Value> valueForEntitlement(std::string_view) override { return entitlement; }
+  void setExportedObject(std::shared_ptr<ClientSessionInterface> object) override {
+    session = std::move(object);
+  }
+  void setInterruptionHandler(std::function<void()> handler) override { interruption = std::move(handler); }
+  void setInvalidationHandler(std::function<void()> handler) override { _invalidation = std::move(handler); }
+  void resume() override { resumed = true; }
+  std::shared_ptr<ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
+      std::function<void(const std::string&)>) override {
+    return nullptr;  // asked by sessions with an aggregator alone
+  }
+  // As the connection's own thread does it at the end.
+  void invalidate() {
+    std::exchange(_invalidation, nullptr)();
+    std::exchange(session, nullptr)->end();
+  }
+
+  std::optional<Value> entitlement = Value(true);
+  std::shared_ptr<ClientSessionInterface> session;
+  std::function<void()> interruption;
+  bool resumed = false;
+
+ private:
+  std::function<void()> _invalidation;
+};
+
+// Counts; an open or close out of turn fails the test.
+struct FakeTransaction final : platform::Transaction {
+  void open() override {
+    EXPECT_FALSE(std::exchange(isOpen, true));
+    ++opened;
+  }
+  void close() override { EXPECT_TRUE(std::exchange(isOpen, false)); }
+  bool isOpen = false;
+  int opened = 0;
+};
 
 struct Silent final : MessageLog {
   void writeToLogFile(std::string_view, std::initializer_list<std::string_view>) override {}
@@ -89,7 +128,6 @@ class Agent : public ::testing::Test {
 
   RecordedLog log;
   World world;
-  FakeBackendFactory backends;
   FlushCounters flushes;
   Silent messageLog;
   Source source;
@@ -98,8 +136,8 @@ class Agent : public ::testing::Test {
   // The agent never looks at it, so there is none behind the reference.
   alignas(16) char nobody[16] = {};
   Listener& door = reinterpret_cast<Listener&>(nobody);
-  VeltradAgent agent{{backends, world.device, world.library, world.clock, world.preferences, world.locale,
-                      world.counters, flushes, messageLog},
+  VeltradAgent agent{{world.factory, world.device, world.library, world.clock, world.preferences,
+                      world.locale, world.counters, flushes, messageLog},
                      source,
                      transaction};
 };
@@ -113,7 +151,7 @@ TEST_F(Agent, LetsInOnlyABooleanTrue) {
     EXPECT_FALSE(connection->resumed);
     EXPECT_EQ(connection->session, nullptr);
   }
-  EXPECT_EQ(transaction.opened(), 0);
+  EXPECT_EQ(transaction.opened, 0);
   EXPECT_EQ(agent.sessionCount(), 0u);
 }
 
@@ -123,13 +161,13 @@ TEST_F(Agent, TheTransactionIsOpenWhileAnySessionLives) {
   const auto second = connect();
   first->interruption();
   EXPECT_EQ(agent.sessionCount(), 2u);
-  EXPECT_EQ(transaction.opened(), 1);
+  EXPECT_EQ(transaction.opened, 1);
   first->invalidate();
-  EXPECT_TRUE(transaction.isOpen());
+  EXPECT_TRUE(transaction.isOpen);
   second->invalidate();
-  EXPECT_FALSE(transaction.isOpen());
+  EXPECT_FALSE(transaction.isOpen);
   connect()->invalidate();
-  EXPECT_EQ(transaction.opened(), 2);
+  EXPECT_EQ(transaction.opened, 2);
 }
 
 TEST_F(Agent, AnEmptiedListStaysAndALeavingSessionIsForgotten) {

@@ -1,0 +1,74 @@
+"""One session of several back ends: what a message must hold, which answer counts, when a flush is answered."""
+import json
+
+from harness import DEVICE, storebag
+from test_https import HTTPSTest, entry
+
+SEND = "sendMessageWithDictionary:reply:"
+
+
+class Sessions(HTTPSTest):
+    def serve_two(self, **more):
+        """Back ends that post to paths of their own."""
+        posting = {"httppost": {"clients": [entry(post_url="${url}/events/one")]},
+                   "httppost2": {"clients": [entry(post_url="${url}/events/two")], "display_url": ""}}
+        self.lab.put("quindle", storebag(backends={**posting, **more}))
+
+    def test_what_a_message_must_hold(self):
+        self.serve_two()
+        cases = [({"type": 1}, None), ({"category": 1}, None), ({"category": "5", "type": 1}, None),
+                 ({"category": 65541, "type": -1}, (5, 65535)),
+                 ({"category": 5.9, "type": True, "payload": 3, "flag": "x"}, (5, 1))]
+        with self.serving("SESSION_TYPE_STOP message dictionary is nil"):
+            client = self.client()
+            for message, expected in cases:
+                with self.subTest(message):
+                    reply = client.ask(SEND, message=message).get("reply")
+                    event = json.loads(reply)["events"][0] if reply else {}
+                    self.assertEqual(event and (event["_method"], event["_status"]), expected or {})
+
+    def test_a_flush_is_answered_at_the_first_error_or_the_last_back_end(self):
+        dashboard = {"ip": "127.0.0.1", "port": "${dashboardPort}", "display_url": "https://dash.example/1"}
+        self.serve_two(dashboard=dashboard, carrierpigeon={})
+        with self.serving("VeltraBackend(newBackendWithName): carrierpigeon") as daemon:
+            client = self.client(batchEvent=True)
+            self.assertEqual(client.backends, ["dashboard", "httppost", "httppost2"])
+            self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "")  # of the first that has one
+            for round, (status, error) in enumerate(((200, None), (503, 503)), 1):
+                client.message(number=round)
+                self.lab.control(path="/events/one", stall=True)
+                self.lab.control(path="/events/two", status=status)
+                client.begin("flushMessagesWithCompletion:")
+                daemon.wait_for_line("internalFlushMessagesWithCompletion: httppost2", round)
+                for other in range(1000, 1020 if error is None else 1000):  # a flush that was answered would come first
+                    client.send(client.CALL, {"op": "fetchDisplayURL:", "args": {}}, other)
+                    self.assertEqual(client.frame()[1], other)
+                if error is None:
+                    self.lab.reset()
+                answer = client.expect()
+                self.lab.reset()
+                self.assertEqual(answer.get("error", {}).get("code"), error)
+                self.assertEqual(json.loads(answer["reply"])["events"][-1]["number"], round)
+            daemon.wait_for_line("<7>internalFlushMessagesWithCompletion: httppost", 4)
+            client.ask("fetchDisplayURL:")  # no second answer came before this one's
+            client.close()
+
+    def test_without_back_ends_everything_fails_politely(self):
+        self.lab.put("ostvane", storebag(backends={"carrierpigeon": {}}))
+        with self.serving("VeltraBackend(newBackendWithName)", "Could not find storebag name for client type 2"):
+            none, empty = self.client(client_type=2), self.client(client_type=6)
+            self.assertEqual((none.backends, none.message()), (None, None))
+            self.assertEqual(none.flush(), (None, -1, "No backends available to send message"))
+            self.assertEqual((empty.backends, empty.message(), empty.flush()), ([], None, (None, None, None)))
+
+    def test_an_internal_release_reports_the_whole_device(self):
+        self.root.write("etc/veltrad/device.plist", {**DEVICE, "ReleaseType": "Internal", "SerialNumber": ""})
+        self.root.write("var/lib/veltrad/preferences/com.florn.timed.plist", {"TMAutomaticTimeZoneEnabled": False})
+        with self.serving(env={"LANG": "C"}):
+            self.lab.put("quindle", storebag(locale_whitelist=[], override_dnu=1, client="phone"))
+            self.serve(entry(post_url="${url}/events"), display_url="x")
+            self.client().close()
+            start, _ = self.lab.wait_for_events(2)
+        expected = {"SerialNum": "Unknown", "Version": "12.1", "Build": "21B74", "Hardware": "E42", "Product": "Elm",
+                    "ReportVers": "8.0", "AutomaticTimeSet": False, "Locale": None}
+        self.assertEqual({key: start.get(key) for key in expected}, expected)
