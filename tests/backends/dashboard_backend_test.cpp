@@ -8,7 +8,6 @@
 
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/dashboard/log_data_uploads.h"
-#include "base/property_list.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
 #include "platform/file_descriptor.h"
@@ -17,7 +16,6 @@
 namespace veltrad {
 namespace {
 
-using namespace std::chrono_literals;
 using namespace std::string_literals;
 using Level = platform::LogLevel;
 
@@ -26,9 +24,8 @@ constexpr platform::TimeValue kTime{1'400'000'000, 123'456};
 
 // A dashboard on loopback. Whoever waits for a datagram in vain gets none after 10 s.
 struct DashboardServer {
-  explicit DashboardServer(std::uint16_t onPort = 0)
-      : socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
-    auto address = *platform::parseIPv4Address("127.0.0.1", onPort);
+  DashboardServer() : socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
+    auto address = *platform::parseIPv4Address("127.0.0.1", 0);
     socklen_t size = sizeof address;
     const timeval patience{10, 0};
     ::setsockopt(socket.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
@@ -38,19 +35,11 @@ struct DashboardServer {
   }
   std::string receive() {
     char bytes[2048];
-    socklen_t size = sizeof client;
-    const auto length =
-        ::recvfrom(socket.get(), bytes, sizeof bytes, 0, reinterpret_cast<sockaddr*>(&client), &size);
+    const auto length = ::recv(socket.get(), bytes, sizeof bytes, 0);
     return length < 0 ? "nothing came"s : std::string(bytes, static_cast<std::size_t>(length));
-  }
-  // To the sender of the last datagram that `heard` received.
-  void answer(const DashboardServer& heard, const std::string& bytes) {
-    ::sendto(socket.get(), bytes.data(), bytes.size(), 0, reinterpret_cast<const sockaddr*>(&heard.client),
-             sizeof client);
   }
   platform::FileDescriptor socket;
   std::uint16_t port = 0;
-  sockaddr_in client{};
 };
 
 class Dashboard : public ::testing::Test {
@@ -143,46 +132,16 @@ TEST_F(Dashboard, AProfileThatNamesNoServerMakesNone) {
   refused(Dictionary{{"ip", "255.255.255.255"}, {"port", 9}}, "socket connect() failed.");
 }
 
-TEST_F(Dashboard, AnAcknowledgementEndsRetransmission) {
-  const auto backend = make({{"reliable", 100}, {"display_url", "https://d.example/"}});
-  EXPECT_EQ(backend->displayURL(), "https://d.example/");
-  backend->sendMessage(nullptr, kTime, 1, 1, 0);
-  backend->sendMessage(nullptr, kTime, 1, 2, 0);
-  const std::string first = server.receive();
-  const std::string second = server.receive();
-  EXPECT_EQ(server.receive(), first);  // again, and again in order
-  EXPECT_EQ(server.receive(), second);
-
-  DashboardServer stranger;
-  stranger.answer(server, first);
-  std::string unknown = first;
-  unknown[60] = '\x77';
-  for (const std::string& bytes : {""s, first.substr(0, 61), unknown, first}) server.answer(server, bytes);
-  const auto deadline = std::chrono::steady_clock::now() + 10s;
-  while (world.counters.value("datagram acknowledged") < 1 && std::chrono::steady_clock::now() < deadline)
-    std::this_thread::yield();
-  EXPECT_EQ(world.counters.value("acknowledgement ignored: shorter than 62 bytes"), 1u);
-  EXPECT_EQ(world.counters.value("acknowledgement ignored: no such datagram waits"), 1u);
-
-  backend->cleanup();
-  server.answer(server, second.substr(0, 62));
-  log.expectLine(Level::debug, "DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
-  world.pool.drain(std::chrono::steady_clock::now() + 8s);  // the clean-up, not its last resort
-  EXPECT_EQ(world.counters.value("datagram acknowledged"), 2u);
-  backend->sendMessage(nullptr, kTime, 1, 3, 0);
-  EXPECT_EQ(world.counters.value("datagram lost: its back end ended before it was sent"), 1u);
-}
-
-TEST_F(Dashboard, WhatARefusedPeerDidNotTakeComesWithTheNextTick) {
-  auto gone = std::make_unique<DashboardServer>();
-  const std::uint16_t port = gone->port;
-  gone.reset();
-  const auto backend = make({{"port", unsigned{port}}});
-  backend->sendMessage(nullptr, kTime, 1, 1, 0);  // is what the peer refuses
-  backend->sendMessage(nullptr, kTime, 1, 2, 0);
-  EXPECT_EQ(world.counters.value("datagram held: the socket did not take it"), 1u);
-  DashboardServer back(port);
-  EXPECT_EQ(back.receive().substr(18, 2), "\0\2"s);
+TEST_F(Dashboard, LogDataIsBoundedInAllAndNeedsAnAddress) {
+  const Array large{std::string(LogDataUploads::kMostBytes / 2, 'x')};
+  const auto backend = make({{"post_url", "https://l.example/logs"}});
+  auto first = std::async(std::launch::async, [&] { return backend->uploadLogData(large); });
+  EXPECT_TRUE(world.http.waitForRequest());
+  log.expectLine(Level::error, "array (Too many log data uploads under way)");
+  EXPECT_FALSE(make({{"post_url", "https://l.example/"}})->uploadLogData(large));
+  EXPECT_TRUE(world.http.answerNext(FakeHTTPClient::response(200, "/logs/124")) && first.get());
+  log.expectLine(Level::error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
+  EXPECT_FALSE(make()->uploadLogData(large));
 }
 
 TEST_F(Dashboard, ManyBackEndsShareTwoThreadsAndTheEndCountsWhatWaits) {
@@ -200,40 +159,6 @@ TEST_F(Dashboard, ManyBackEndsShareTwoThreadsAndTheEndCountsWhatWaits) {
   world.pool.drain(std::chrono::steady_clock::now());
   world.pool.discard();
   EXPECT_EQ(world.counters.value("datagram given up: not acknowledged before its back end ended"), 300u);
-}
-
-TEST_F(Dashboard, LogDataIsPostedAndItsPlaceAnnounced) {
-  const auto backend = make({{"post_url", "https://l.example/logs"}});
-  const Array logData{Dictionary{{"line", 1}}, "two"};
-  const auto upload = [&](platform::HTTPResult answer) {
-    auto uploaded = std::async(std::launch::async, [&] { return backend->uploadLogData(logData); });
-    const auto held = world.http.waitForRequest();
-    EXPECT_EQ(held->request.method, platform::HTTPRequest::Method::post);
-    EXPECT_EQ(held->request.url, "https://l.example/logs");
-    EXPECT_EQ(held->request.headers, (platform::HTTPHeaders{{"Content-Type", "application/octet-stream"}}));
-    const auto archive = parseBinaryPropertyList(held->request.body);
-    EXPECT_TRUE(archive.ok() && archive.value() == Value(logData));
-    world.http.answer(held, std::move(answer));
-    return uploaded.get();
-  };
-  log.expectLine(Level::error, "DashboardBackend(uploadLogData): Error uploading log data array ()");
-  EXPECT_FALSE(upload(FakeHTTPClient::response(200)));
-  log.expectLine(Level::error, "DashboardBackend(uploadLogData): Error uploading log data array (no route)");
-  EXPECT_FALSE(upload(FakeHTTPClient::error(platform::HTTPError::Kind::transport, "no route")));
-  EXPECT_TRUE(upload(FakeHTTPClient::response(500, "/logs/123")));
-  const std::string datagram = server.receive();  // the first one of this back end
-  EXPECT_EQ(datagram.substr(16, 4) + datagram.substr(60),
-            "\0\0\0\2\0\1\0\0 LogDataUploadLocation=/logs/123"s);
-
-  const Array large{std::string(LogDataUploads::kMostBytes / 2, 'x')};
-  auto first = std::async(std::launch::async, [&] { return backend->uploadLogData(large); });
-  EXPECT_TRUE(world.http.waitForRequest());
-  log.expectLine(Level::error, "array (Too many log data uploads under way)");
-  EXPECT_FALSE(make({{"post_url", "https://l.example/"}})->uploadLogData(large));
-  EXPECT_TRUE(world.http.answerNext(FakeHTTPClient::response(200, "/logs/124")) && first.get());
-
-  log.expectLine(Level::error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
-  EXPECT_FALSE(make()->uploadLogData(logData));
 }
 
 }  // namespace

@@ -8,10 +8,9 @@
 #include "base/base64.h"
 #include "base/property_list.h"
 #include "config/process_settings.h"
-#include "fakes/fake_device_properties.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
-#include "fakes/fake_preferences.h"
+#include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 #include "platform/root.h"
 #include "protocol/veltra.h"
@@ -48,7 +47,7 @@ struct Configuration {
   platform::Root root{"/"};
   FakeDeviceProperties properties;
   DeviceIdentity device{properties};
-  FakePreferences preferences;
+  MemoryPreferences preferences;
   FakeFileStore files;
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra veltra{files, preferences, root};

@@ -12,8 +12,7 @@ namespace {
 
 struct Machine : Configuration {
   Machine(bool internal, const char* key, const std::optional<Value>& preference) {
-    preferences.remove("environmentType");
-    preferences.remove("veltra_storebag_url");
+    preferences.clear();
     if (preference) preferences.set(key, *preference);
     if (internal) properties.set("ReleaseType", "Internal");
   }

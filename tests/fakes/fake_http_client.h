@@ -64,9 +64,10 @@ class FakeHTTPClient final : public platform::HTTPClient {
   }
 
   // The oldest one not answered yet; waits for it, null when none came in time.
-  HeldRequest waitForRequest(std::chrono::milliseconds within = std::chrono::seconds(10)) const {
+  HeldRequest waitForRequest() const {
     std::unique_lock lock(_mutex);
-    return _changed.wait_for(lock, within, [&] { return !_held.empty(); }) ? _held.front() : nullptr;
+    const bool came = _changed.wait_for(lock, std::chrono::seconds(10), [&] { return !_held.empty(); });
+    return came ? _held.front() : nullptr;
   }
   // Runs the completion here. Answering a second time is a fault of the test.
   void answer(const HeldRequest& held, platform::HTTPResult result) {
@@ -77,8 +78,8 @@ class FakeHTTPClient final : public platform::HTTPClient {
     std::exchange(held->completion, nullptr)(std::move(result));
   }
   // The oldest one; false when none came in time.
-  bool answerNext(platform::HTTPResult result, std::chrono::milliseconds within = std::chrono::seconds(10)) {
-    const HeldRequest held = waitForRequest(within);
+  bool answerNext(platform::HTTPResult result) {
+    const HeldRequest held = waitForRequest();
     if (held) answer(held, std::move(result));
     return held != nullptr;
   }

@@ -4,13 +4,9 @@
 
 #include "backends/backend_factory.h"
 #include "config/process_settings.h"
-#include "fakes/fake_clock.h"
-#include "fakes/fake_device_properties.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
-#include "fakes/fake_locale.h"
-#include "fakes/fake_preferences.h"
-#include "fakes/fake_random.h"
+#include "fakes/machine.h"
 #include "platform/code_bundle.h"
 #include "platform/counters.h"
 #include "platform/energy_log.h"
@@ -32,7 +28,7 @@ struct World {
   FakeClock clock;
   FakeRandom random;
   FakeLocale locale;
-  FakePreferences preferences;
+  MemoryPreferences preferences;
   FakeDeviceProperties properties;
   FakeFileStore files;
   platform::Counters counters;

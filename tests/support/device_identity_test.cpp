@@ -6,7 +6,7 @@
 #include <thread>
 #include <vector>
 
-#include "fakes/fake_device_properties.h"
+#include "fakes/machine.h"
 
 namespace veltrad {
 namespace {

@@ -11,7 +11,7 @@
 #include <latch>
 #include <thread>
 
-#include "fakes/fake_clock.h"
+#include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 #include "fakes/temporary_directory.h"
 

@@ -1,0 +1,88 @@
+// What a machine says of itself, as the test sets it: time, locale, draws, device, preferences. Any thread,
+// but the locale and the draw are set before threads start.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "fakes/fake_file_store.h"
+#include "platform/clock.h"
+#include "platform/device_properties.h"
+#include "platform/locale.h"
+#include "platform/preferences.h"
+#include "platform/random.h"
+
+namespace veltrad {
+
+// Stands still until the test moves it.
+class FakeClock final : public platform::Clock {
+ public:
+  explicit FakeClock(platform::TimeValue time = {1'700'000'000, 250'000})
+      : _microseconds(time.seconds * 1'000'000 + time.microseconds) {}
+  platform::TimeValue now() const override {
+    const std::int64_t time = _microseconds;
+    return {time / 1'000'000, static_cast<std::int32_t>(time % 1'000'000)};
+  }
+  void advance(double seconds) { _microseconds += static_cast<std::int64_t>(seconds * 1'000'000); }
+
+ private:
+  std::atomic<std::int64_t> _microseconds;
+};
+
+struct FakeLocale final : platform::Locale {
+  std::optional<std::string> countryCode() override { return "DE"; }
+  int timeZoneOffset() override { return 3'600; }
+};
+
+struct FakeRandom final : platform::Random {
+  double uniform() override { return draw; }
+  double draw = 0.5;
+};
+
+// Begins as a customer's machine with every fact but "ReleaseType".
+class FakeDeviceProperties final : public platform::DeviceProperties {
+ public:
+  std::optional<std::string> value(std::string_view key) override {
+    std::lock_guard lock(_mutex);
+    const auto found = _values.find(key);
+    return found == _values.end() ? std::nullopt : std::optional(found->second);
+  }
+  void set(const std::string& key, const std::string& value) {
+    std::lock_guard lock(_mutex);
+    _values[key] = value;
+  }
+
+ private:
+  std::mutex _mutex;
+  std::map<std::string, std::string, std::less<>> _values{
+      {"ProductVersion", "12"},
+      {"BuildVersion", "12A301"},
+      {"ProductType", "Workbench 3"},
+      {"DeviceName", "Desktop"},
+      {"HWModelStr", "WB3-B"},
+      {"SerialNumber", "S0123456789"},
+      {"UniqueDeviceID", "00112233445566778899aabbccddeeff00112233"},
+  };
+};
+
+// The real ones over files in memory.
+class MemoryPreferences {
+ public:
+  operator platform::Preferences&() { return _preferences; }
+  // In the domain kVeltraPreferenceDomain.
+  void set(std::string_view key, const Value& value) {
+    _preferences.setValue(platform::kVeltraPreferenceDomain, key, value);
+  }
+  void clear() { _files.remove("/preferences/com.florn.veltra.plist"); }
+
+ private:
+  FakeFileStore _files;
+  platform::FilePreferences _preferences{_files, "/preferences"};
+};
+
+}  // namespace veltrad
