@@ -4,8 +4,6 @@
 #include <gtest/gtest.h>
 #include <linux/sockios.h>
 #include <sys/ioctl.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 
 #include <algorithm>
 #include <chrono>
@@ -19,9 +17,8 @@
 
 #include "base/json.h"
 #include "base/property_list.h"
-#include "fakes/temporary_directory.h"
+#include "fakes/unix_socket.h"
 #include "ipc/frame.h"
-#include "platform/file_descriptor.h"
 #include "platform/root.h"
 
 namespace veltrad {
@@ -76,17 +73,6 @@ class TemporaryRoot : private TemporaryDirectory, public platform::Root {
   using platform::Root::path;
   TemporaryRoot() : Root(TemporaryDirectory::path()) { std::filesystem::create_directories(runDirectory()); }
 };
-
-// A Unix socket bound to `path` or connected to it.
-template <typename Attach>
-platform::FileDescriptor unixSocket(Attach attach, const std::string& path, int type = SOCK_STREAM) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
-  platform::FileDescriptor made(::socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
-  EXPECT_EQ(attach(made.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0) << path;
-  return made;
-}
 
 // A header with any body behind it, and any length in it.
 inline std::string rawFrame(FrameKind kind, std::string_view body, std::optional<std::size_t> length = {},

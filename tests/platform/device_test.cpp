@@ -83,13 +83,6 @@ TEST_F(MachinePropertiesTest, NamesTheClassOfTheDevice) {
   }
 }
 
-TEST(MachineFacts, KnowsChassisTypes) {
-  std::string names;
-  for (const int type : {0, 1, 2, 3, 9, 11, 17, 23, 30, 31, 34, 3 | 0x80, 35, 99})
-    names += deviceNameOfChassisType(type).value_or("-") + " ";
-  EXPECT_EQ(names, "- - - Desktop Laptop Handset Server Server Tablet Laptop Embedded Desktop Desktop - ");
-}
-
 TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChanges) {
   const std::string id = "3d1219c7c4c5404aaa1f6d2a48adfda4";
   _files.put("/etc/machine-id", id + "\n");

@@ -2,14 +2,12 @@
 #include "platform/entitlements.h"
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
-#include "fakes/temporary_directory.h"
+#include "fakes/unix_socket.h"
 #include "platform/child_process.h"
 #include "platform/peer.h"
 
@@ -123,14 +121,9 @@ TEST(SystemUnit, IsTheFirstBelowTheSlicesAndNeverAUsers) {
 
 TEST(PeerOfSocket, SaysWhoConnectedAndGivesTheDeadNoUnit) {
   const TemporaryDirectory directory;
-  sockaddr_un address{AF_UNIX, {}};
-  directory.path("s").copy(address.sun_path, sizeof address.sun_path - 1);
-  const FileDescriptor listening(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  ASSERT_EQ(::bind(listening.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  const FileDescriptor listening = unixSocket(::bind, directory.path("s"));
   ASSERT_EQ(::listen(listening.get(), 1), 0);
-  const ChildProcess child([&](const auto&) {
-    ::connect(::socket(AF_UNIX, SOCK_STREAM, 0), reinterpret_cast<sockaddr*>(&address), sizeof address);
-  });
+  const ChildProcess child([&](const auto&) { unixSocket(::connect, directory.path("s")); });
   const FileDescriptor accepted(::accept4(listening.get(), nullptr, nullptr, SOCK_CLOEXEC));
   const auto peer = peerOfSocket(accepted.get());
   ASSERT_TRUE(peer);

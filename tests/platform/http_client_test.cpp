@@ -133,7 +133,6 @@ TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
   headers += "}}";
   const std::string body = R"("body": ")" + std::string(2000, 'x') + "\"}";
   const std::tuple<std::string, std::size_t, const char*> cases[] = {
-      {R"({"path": "/", "cutHalfway": true, )" + body, 16u << 20, ""},
       {R"({"path": "/", "endless": true})", 100'000, "The answer is larger than 100000 bytes"},
       {R"({"path": "/", )" + body, 1000, "The answer is larger than 1000 bytes"},
       {headers, 100'000, "The answer is larger than 100000 bytes"},
@@ -146,15 +145,6 @@ TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
     if (rule == kStall) request.timeout = 300ms;
     EXPECT_TRANSPORT_ERROR(client.perform(std::move(request)), HasSubstr(text));
   }
-}
-
-TEST_F(HTTPClientTest, APostIsNeverSentTwice) {
-  const Server server({R"({"path": "/cut", "cut": true})"});
-  ASSERT_TRUE(client.perform(post(server.url(), "kept alive")).ok());
-  for (const char* connection : {"kept", "new"}) {
-    EXPECT_TRANSPORT_ERROR(client.perform(post(server.url("/cut"), connection)), "Empty reply from server");
-  }
-  EXPECT_EQ(server.requests().size(), 3u);
 }
 
 TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {
@@ -224,26 +214,6 @@ TEST_F(HTTPClientTest, UploadsRunTwoAtATime) {
   ASSERT_TRUE(hung.waitForRequests(2));
   EXPECT_TRUE(client.perform(get(healthy.url("/x"))).ok());  // what would have come has come before this
   EXPECT_EQ(hung.requests().size(), 2u);
-}
-
-TEST_F(HTTPClientTest, WaitersAreFreedAndLaterOnesFailAtOnce) {
-  auto waiter = std::async(std::launch::async, [&] { return client.perform(get(hung.url("/x"))); });
-  auto event = start(post(hung.url(), "x"));
-  ASSERT_TRUE(hung.waitForRequests(2));
-  client.failBlockingWaits();
-  EXPECT_EQ(waiter.get().error().kind, HTTPError::Kind::stopping);
-  EXPECT_EQ(client.perform(get(hung.url("/x"))).error().kind, HTTPError::Kind::stopping);
-  EXPECT_EQ(client.underWay(), 1u);  // posts go on
-}
-
-TEST_F(HTTPClientTest, DrainWaitsForWhatEndsInTime) {
-  std::atomic<int> done{0};
-  for (int i = 0; i < 50; ++i) {
-    client.start(post(healthy.url(), "x"), [&](HTTPResult result) { done += result.ok() ? 1 : 0; });
-  }
-  client.drain(std::chrono::steady_clock::now() + 20s);
-  EXPECT_EQ(done, 50);
-  EXPECT_TRUE(client.perform(get(healthy.url())).ok());
 }
 
 TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {

@@ -1,13 +1,11 @@
-// The process's own services: run loop, sandbox, service manager, counters, draws.
+// The process's own services: sandbox, service manager, counters.
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
-#include <signal.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 
 #include <cerrno>
 #include <thread>
@@ -15,41 +13,15 @@
 #include "base/json.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
-#include "fakes/temporary_directory.h"
+#include "fakes/unix_socket.h"
 #include "platform/child_process.h"
 #include "platform/counters.h"
 #include "platform/landlock.h"
-#include "platform/random.h"
-#include "platform/run_loop.h"
 #include "platform/sandbox.h"
 #include "platform/service_manager.h"
-#include "platform/uuid.h"
 
 namespace veltrad::platform {
 namespace {
-
-using namespace std::chrono_literals;
-
-TEST(RunLoop, GoesOnUntilItIsAskedToEnd) {
-  for (const int signal : {SIGTERM, SIGINT, 0}) {
-    const ChildProcess child([&](const auto& say) {
-      RunLoop loop;
-      loop.blockSignals();
-      std::thread stopper;
-      int ticks = 0;
-      const int ended = loop.run(1ms, [&] {
-        if (++ticks == 1) ::kill(::getpid(), SIGHUP), ::kill(::getpid(), SIGPIPE);
-        if (ticks == 3 && signal) ::kill(::getpid(), signal);
-        if (ticks == 3 && !signal) stopper = std::thread([&] { loop.stop(); });
-      });
-      if (stopper.joinable()) stopper.join();
-      say(std::to_string(ended) + (ticks >= 3 ? "" : " early"));
-    });
-    EXPECT_EQ(child.said, std::to_string(signal) + "\n");
-  }
-}
-
-// ---- sandbox
 
 int errorOf(int result) {
   return result >= 0 ? 0 : errno;
@@ -88,16 +60,12 @@ TEST(Sandbox, LeavesWhatTheProfileNamesAndTheNetwork) {
     expect("make a directory", errorOf(::mkdir(path("w/d").c_str(), 0755)), 0);
     expect("remove a directory", errorOf(::rmdir(path("w/d").c_str())), 0);
     expect("make a link", errorOf(::symlink("/", path("w/l").c_str())), EACCES);
-    sockaddr_un local{AF_UNIX, {}};
-    path("w/s").copy(local.sun_path, sizeof local.sun_path - 1);
-    const auto binding = [](int family, auto& address) {
-      const int socket = ::socket(family, SOCK_STREAM, 0);
-      return errorOf(::bind(socket, reinterpret_cast<sockaddr*>(&address), sizeof address));
-    };
-    expect("bind a socket", binding(AF_UNIX, local), 0);
-    expect("remove a socket", errorOf(::unlink(local.sun_path)), 0);
-    sockaddr_in any{AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
-    expect("the network", binding(AF_INET, any), 0);
+    unixSocket(::bind, path("w/s"));
+    expect("a bound socket", errorOf(::access(path("w/s").c_str(), F_OK)), 0);
+    expect("remove a socket", errorOf(::unlink(path("w/s").c_str())), 0);
+    const sockaddr_in any{AF_INET, 0, {htonl(INADDR_LOOPBACK)}, {}};
+    const int network = ::socket(AF_INET, SOCK_STREAM, 0);
+    expect("the network", errorOf(::bind(network, reinterpret_cast<const sockaddr*>(&any), sizeof any)), 0);
     expect("run a program", errorOf(::execl("/bin/true", "true", nullptr)), EACCES);
     expect("no new privileges", ::prctl(PR_GET_NO_NEW_PRIVS, 0, 0, 0, 0), 1);
     std::thread([&] { expect("a thread that starts later", opening("other/x", O_RDONLY), EACCES); }).join();
@@ -120,17 +88,6 @@ TEST(Sandbox, RequiredIsFatalWhereTheKernelCannotAndAnUnknownChoiceEverywhere) {
   EXPECT_EQ(child.said.find("without"), std::string::npos);
 }
 
-// ---- service manager
-
-int boundSocket(const std::string& path, int type) {
-  sockaddr_un address{AF_UNIX, {}};
-  path.copy(address.sun_path, sizeof address.sun_path - 1);
-  const int socket = ::socket(AF_UNIX, type | SOCK_NONBLOCK, 0);
-  EXPECT_EQ(::bind(socket, reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
-  if (type == SOCK_STREAM) ::listen(socket, 1);
-  return socket;
-}
-
 TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
   const struct {
     const char* count;
@@ -143,8 +100,9 @@ TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
   for (const auto& c : cases) {
     const TemporaryDirectory directory;
     const ChildProcess child([&](const auto& say) {
-      const int socket = boundSocket(directory.path("s"), c.type);
-      for (const int handed : {3, 4}) ::dup2(socket, handed);
+      const auto socket = unixSocket(::bind, directory.path("s"), c.type);
+      ::listen(socket.get(), 1);
+      for (const int handed : {3, 4}) ::dup2(socket.get(), handed), ::fcntl(handed, F_SETFD, 0);
       ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
       if (c.count) ::setenv("LISTEN_FDS", c.count, 1);
       const auto taken = ServiceManager().handedOverSocket();
@@ -155,8 +113,6 @@ TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
     EXPECT_EQ(child.said, c.verdict);
   }
 }
-
-// ---- counters, draws, names
 
 TEST(Counters, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
   RecordedLog log;
@@ -177,22 +133,6 @@ TEST(Counters, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
                             {"started", 1'700'000'000.5},
                             {"counts", Dictionary{{"message dropped: the queue is full", 42}}}};
   EXPECT_EQ(parseJSON(files.bytes("/run/c").value_or("")).value(), Value(expected));
-}
-
-TEST(UnseededSequence, IsTheLinearCongruentialOneFromZero) {
-  UnseededSequence random;
-  std::uint64_t state = 0;
-  for (int i = 0; i < 1'000; ++i) {
-    state = (state * 0x5'DEEC'E66D + 0xB) & ((1ull << 48) - 1);
-    ASSERT_EQ(random.uniform(), static_cast<double>(state) / 0x1p48) << i;
-  }
-}
-
-TEST(UUID, IsRandomVersionFourInUpperCase) {
-  const std::string text = randomUUIDText();
-  EXPECT_THAT(text,
-              ::testing::MatchesRegex("[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}"));
-  EXPECT_NE(randomUUIDText(), text);
 }
 
 }  // namespace
