@@ -46,25 +46,6 @@ TEST(BinaryPropertyList, readsEveryType) {
   EXPECT_TRUE(read.value() == Value(Dictionary{{"a", 2}, {"s", Array{"a", 2}}}));
 }
 
-TEST(BinaryPropertyList, writesWhatItReads) {
-  Array many;
-  for (int i = 0; i < 300; ++i) many.push_back(i);  // more objects than one byte of reference reaches
-  const Value value = Dictionary{
-      {"ints",
-       Array{0, 255, 256, 65535, 65536, 4294967295u, 4294967296, -1, INT64_MIN, INT64_MAX, UINT64_MAX}},
-      {"reals", Array{0.0, -0.1, 1e300, HUGE_VAL}},
-      {"texts",
-       Array{"", "plain", std::string(15, 'a'), std::string(70'000, 'b'), "\u00e9", "\U0001F600", "a\0b"s}},
-      {"data", Array{Data{""}, Data{std::string(300, '\xFF')}}},
-      {"\u00fcber", Dictionary{{"date", Date{1.5e9}}, {"yes", true}, {"no", false}, {"none", Dictionary{}}}},
-      {"many", many}};
-  std::string out = "header";
-  appendBinaryPropertyList(value, out);
-  const auto read = parsePropertyList(std::string_view(out).substr(6));
-  ASSERT_TRUE(read.ok()) << read.error().detail;
-  EXPECT_TRUE(read.value() == value);
-}
-
 TEST(BinaryPropertyList, writesTheseBytes) {
   const std::string trailer = std::string(6, '\0') + "\x01\x01" + bigEndian(3, 8) + bigEndian(0, 8);
   EXPECT_EQ(writeBinaryPropertyList(Dictionary{{"k", "\u00e9"}}),
@@ -117,6 +98,27 @@ TEST(BinaryPropertyList, refusesBrokenObjects) {
   expectRefusal(binaryList({container(0xD0, 1, {1, 1}), "\x10\x01"}), Kind::malformed);
   expectRefusal(binaryList({container(0xA0, 1, {0})}), Kind::cyclic);
   expectRefusal(binaryList({container(0xA0, 1, {1}), container(0xC0, 1, {0})}), Kind::cyclic);
+}
+
+TEST(PropertyLists, comeBackInBothForms) {
+  Array many;
+  for (int i = 0; i < 300; ++i) many.push_back(i);  // more objects than one byte of reference reaches
+  const Value value = Dictionary{
+      {"ints", Array{0, 255, 256, 65535, 65536, 4294967296, -1, INT64_MIN, INT64_MAX, UINT64_MAX}},
+      {"reals", Array{0.0, -0.1, 1e300, HUGE_VAL}},
+      {"a<b>&\"\r\n", Array{"", " ", "x\ty", std::string(70'000, 'b'), "\u00e9", "\U0001F600"}},
+      {"data", Array{Data{""}, Data{std::string(300, '\xFF')}, Data{"\0\xFF"s}}},
+      {"\u00fcber",
+       Dictionary{{"dates", Array{Date{0}, Date{-62167219200}, Date{253402300799}}}, {"yes", true}}},
+      {"", Dictionary{{"none", Array{}}, {"no", false}}},
+      {"many", many}};
+  std::string binary = "header";
+  appendBinaryPropertyList(value, binary);
+  for (const std::string& bytes : {binary.substr(6), writeXMLPropertyList(value)}) {
+    const auto read = parsePropertyList(bytes);
+    ASSERT_TRUE(read.ok()) << read.error().detail;
+    EXPECT_TRUE(read.value() == value);
+  }
 }
 
 TEST(PropertyListLimits, holdExactlyInBothForms) {

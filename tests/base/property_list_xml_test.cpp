@@ -99,18 +99,8 @@ TEST(XMLPropertyList, refusesWhatIsNone) {
                     element == "data" ? "base64" : element);
 }
 
-TEST(XMLPropertyList, writesWhatItReads) {
-  const Value value =
-      Dictionary{{"a<b>&\"\r\n", Array{"x\ty", "\u00e9\U0001F600", "", " "}},
-                 {"n", Array{-1, INT64_MIN, UINT64_MAX, 0.1, -1e300, HUGE_VAL, true, false}},
-                 {"d", Array{Date{0}, Date{-62167219200}, Date{253402300799}, Data{"\0\xFF"s}}},
-                 {"e", Dictionary{{"none", Array{}}, {"", Dictionary{}}}}};
-  const std::string text = writeXMLPropertyList(value);
-  const auto read = parsePropertyList(text);
-  ASSERT_TRUE(read.ok()) << read.error().detail << "\n" << text;
-  EXPECT_TRUE(read.value() == value) << text;
-
-  // What XML cannot say is mended; dates lose their fraction and their excess.
+TEST(XMLPropertyList, mendsWhatXMLCannotSay) {
+  // Dates lose their fraction and their excess.
   const auto mended = parsePropertyList(
       writeXMLPropertyList(Array{"\x01 \xFF \uFFFE", Date{-0.5}, Date{HUGE_VAL}, Date{NAN}}));
   ASSERT_TRUE(mended.ok()) << mended.error().detail;
