@@ -1,6 +1,4 @@
 // Sessions against a scripted daemon: calls out and answers in, one after the other and many at once.
-#include <fcntl.h>
-
 #include "harness.h"
 
 namespace veltrad::client_test {
@@ -207,23 +205,6 @@ TEST(Session, RefusesAWaitInsideACallbackAndServesOthersWhileItTakesLong) {
   EXPECT_EQ(veltra_session_send_wait(inside.session.get(), 3, 4, nullptr, 0, nullptr), VELTRA_OK);
   inside.leave.open();
   inside.session.reset();  // before what its callback uses
-}
-
-TEST(Session, LeavesNoDescriptorBehindAndNoneToOtherPrograms) {
-  const auto countWithout = [](int flags) {  // open ones that have none of the flags
-    int count = 0;
-    for (int number = 0; number < 1024; ++number) {
-      const int has = ::fcntl(number, F_GETFD);
-      count += has >= 0 && (has & flags) == 0;
-    }
-    return count;
-  };
-  FakeDaemon daemon([](auto&...) {});
-  const int before = countWithout(0), inherited = countWithout(FD_CLOEXEC);
-  veltra::Session session = open(daemon);
-  EXPECT_EQ(countWithout(FD_CLOEXEC), inherited);
-  session.close();
-  EXPECT_LE(countWithout(0), before + 1);  // the daemon's end stays until the daemon goes
 }
 
 }  // namespace

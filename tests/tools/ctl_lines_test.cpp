@@ -1,10 +1,8 @@
-// What a line of `veltractl session` says or what is wrong with it, and the lines that veltractl prints, byte
-// for byte.
+// What a line of `veltractl session` says or what is wrong with it, and the table of the counters.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "base/json.h"
-#include "tools/ctl/answers.h"
 #include "tools/ctl/counters_report.h"
 #include "tools/ctl/session_lines.h"
 
@@ -57,36 +55,6 @@ TEST(SessionLines, saysWhatIsWrong) {
     EXPECT_THAT(line.error(), testing::HasSubstr(description));
     EXPECT_EQ(line.error().find('\n'), std::string::npos) << description;
   }
-}
-
-Answer withBackends(std::vector<std::string> names) {
-  return {VELTRA_OK, std::nullopt, std::move(names), std::nullopt};
-}
-Answer withError(veltra_status status) {
-  return {status, std::nullopt, std::nullopt, AnswerError{"com.florn.veltra.error", 503, "It said \"no\"."}};
-}
-
-TEST(Answers, standInOneLineOpFirst) {
-  const std::string error =
-      R"("error":{"domain":"com.florn.veltra.error","code":503,"description":"It said \"no\"."}})";
-  const std::pair<std::string, std::string> cases[] = {
-      {formatAnswer(Operation::restart, withBackends({"a", "b\"c"})),
-       R"({"op":"restart","backends":["a","b\"c"]})"},
-      {formatAnswer(Operation::states, withError(VELTRA_NO_DAEMON)),
-       R"({"op":"states","backends":null,)" + error},
-      {formatAnswer(Operation::send, withError(VELTRA_NO_REPLY)), R"({"op":"send","reply":null,)" + error},
-      // The call was answered, so what stands in its error is no answer to a send.
-      {formatAnswer(Operation::send, withError(VELTRA_OK)), R"({"op":"send","reply":null})"},
-      {formatAnswer(Operation::uploadLogData, {VELTRA_OK, {}, {}, {}, true}),
-       R"({"op":"uploadLogData","uploaded":true,"error":null})"},
-      {formatAnswer(Operation::flush, withError(VELTRA_OK)), R"({"op":"flush","reply":null,)" + error},
-      {formatMalformedLine(12, "op \"x\""), R"({"op":"error","line":12,"description":"op \"x\""})"},
-      {formatAggregated({Dictionary{{"sessionID", 42u}}, 1416171234.25, 5, 65535,
-                         Dictionary{{"at", Date{7}}, {"text", "a\nb"}}}),
-       R"({"op":"aggregated","sessionInfo":{"sessionID":42},"timestamp":1416171234.25,"category":5,)"
-       R"("type":65535,"payload":{"at":{"$date":7.0},"text":"a\nb"}})"},
-  };
-  for (const auto& [line, expected] : cases) EXPECT_EQ(line, expected);
 }
 
 TEST(CountersReport, isATableInOrderOfTheReasonsOrNothing) {
