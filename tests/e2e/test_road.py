@@ -35,7 +35,7 @@ class Road(SystemTest):
         post = next(p for p in self.lab.received("events") if p["body"]["events"][0] == event)
         self.assertEqual(set(post["body"]), {"postTime", "clientId", "events"})
         self.assertAlmostEqual(post["body"]["postTime"], time.time(), delta=120)
-        self.assertEqual(len(post["body"]["clientId"]), 36)
+        self.assertRegex(post["body"]["clientId"], "^[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}$")
         headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer",
                    "User-Agent": "Veltra/8.2 (Elm4,2; 12.1)",
                    "X-VLT-Client-Version": "3", "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2",
