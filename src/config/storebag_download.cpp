@@ -5,6 +5,7 @@
 #include <chrono>
 #include <limits>
 
+#include "base/text.h"
 #include "config/process_settings.h"
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
@@ -62,6 +63,17 @@ bool isNotModified(const platform::HTTPResponse& response, std::optional<std::st
 
 }  // namespace
 
+namespace {
+// All lines of the header as one.
+std::optional<std::string> cacheControlOf(const platform::HTTPResponse& response) {
+  std::optional<std::string> all;
+  for (const auto& [name, value] : response.headers) {
+    if (equalIgnoringCase(name, "Cache-Control")) all = all ? *all + ", " + value : value;
+  }
+  return all;
+}
+}  // namespace
+
 std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl) {
   if (!cacheControl) return kDefaultMaxAgeSeconds;
   std::string_view rest = *cacheControl;
@@ -101,7 +113,7 @@ std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::str
     return defaultStorebag();
   }
   const platform::HTTPResponse& response = answer.value();
-  maxAge = maxAgeOfCacheControl(response.header("Cache-Control"));
+  maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   if (lastModified != nullptr && isNotModified(response, *lastModified)) {
     notModified = true;
     return std::nullopt;

@@ -35,7 +35,7 @@ CorrelatedList::SessionPointer CorrelatedList::take(const Place& place) {
   return taken;
 }
 
-CorrelatedList::SessionPointer CorrelatedList::getFirstSessionWithHierarchy(std::int32_t hierarchy) const {
+CorrelatedList::SessionPointer CorrelatedList::getFirstSessionWithHierarchy(std::int64_t hierarchy) const {
   const auto level = _levels.find(hierarchy);
   return level == _levels.end() ? nullptr : level->second.begin()->second;
 }

@@ -34,7 +34,7 @@ class CorrelatedList {
   bool empty() const { return _places.empty(); }
 
   // The first that joined of those with this hierarchy number, or null.
-  SessionPointer getFirstSessionWithHierarchy(std::int32_t hierarchy) const;
+  SessionPointer getFirstSessionWithHierarchy(std::int64_t hierarchy) const;
   // The first of each level from 0 to `hierarchy` - 1, from the root down: the first of these that
   // aggregates, or null.
   SessionPointer topmostAggregator(std::int32_t hierarchy) const;
@@ -53,7 +53,7 @@ class CorrelatedList {
 
   std::uint64_t _nextJoined = 0;
   std::unordered_map<const VeltradSession*, Place> _places;
-  std::map<std::int32_t, Level> _levels;
+  std::map<std::int64_t, Level> _levels;
 };
 
 }  // namespace veltrad

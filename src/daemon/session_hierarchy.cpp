@@ -61,10 +61,11 @@ std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const Veltra
   const Lock held(_lock);
   const CorrelatedList* list = listHolding(session, key, "parentSessionForChild");
   if (!list) return nullptr;
-  auto parent = list->getFirstSessionWithHierarchy(hierarchy - 1);
+  const std::int64_t above = std::int64_t{hierarchy} - 1;
+  auto parent = list->getFirstSessionWithHierarchy(above);
   if (!parent) {
-    logInfo("parentSessionForChild: Unable to find session with hierarchy of %d for userInfoKey '%s'",
-            hierarchy - 1, key.c_str());
+    logInfo("parentSessionForChild: Unable to find session with hierarchy of %lld for userInfoKey '%s'",
+            static_cast<long long>(above), key.c_str());
   }
   return parent;
 }

@@ -63,6 +63,7 @@ CurlTransfer::CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool 
       _blocking(blocking),
       _host(hostOf(_request.url)),
       _bodySize(_request.body.size()),
+      _arrived(now),
       _deadline(_request.leastBytesPerSecond == 0 ? std::optional<Time>(now + _request.timeout)
                                                   : std::nullopt) {}
 
@@ -116,9 +117,9 @@ bool CurlTransfer::setHeaders(CURL* easy) {
   for (const auto& [name, value] : _request.headers) {
     const std::string_view given = name;
     const auto is = [given](const char* other) { return equalIgnoringCase(given, other); };
-    if (!isToken(given) || is("Content-Length") || is("Transfer-Encoding") || is("Expect")) continue;
+    if (!isToken(given) || is("Transfer-Encoding") || is("Expect")) continue;
     for (auto& [automatic, found] : own) found = found || is(automatic);
-    if (!append(headerLine(name, value))) return false;
+    if (!append(headerLine(name, is("Content-Length") ? std::to_string(_bodySize) : value))) return false;
   }
   for (const auto& [automatic, found] : own) {
     if (!found && !append(std::string(automatic) + ":")) return false;
@@ -204,10 +205,11 @@ std::size_t CurlTransfer::takeHeader(char*, std::size_t size, std::size_t count,
 }
 
 HTTPResult CurlTransfer::result(CURLcode code, CURL* easy) {
-  if (code != CURLE_OK) return Failure{HTTPError{HTTPError::Kind::transport, describe(code)}};
-  HTTPResponse response;
   long status = 0;
   _curl->easyGetinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+  if (code != CURLE_OK)
+    return Failure{HTTPError{HTTPError::Kind::transport, describe(code), static_cast<int>(status)}};
+  HTTPResponse response;
   response.status = static_cast<int>(status);
   curl_header* header = nullptr;  // libcurl leaves the line break of an empty value
   while ((header = _curl->easyNextheader(easy, CURLH_HEADER, -1, header)) != nullptr) {

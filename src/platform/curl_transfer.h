@@ -32,6 +32,8 @@ class CurlTransfer {
     return _host;
   }  // "name:port" as the URL has it: what connections are counted by
   std::size_t bodySize() const { return _bodySize; }
+  std::uintptr_t sequence() const { return _request.sequence; }
+  Time arrived() const { return _arrived; }
   bool blocking() const { return _blocking; }  // somebody waits in perform()
   bool expired(Time now) const { return _deadline && *_deadline <= now; }
 
@@ -73,6 +75,7 @@ class CurlTransfer {
   const bool _blocking;
   const std::string _host;
   const std::size_t _bodySize;
+  const Time _arrived;
   const std::optional<Time> _deadline;  // none: a least speed holds instead
   std::optional<HTTPError> _refused;
 

@@ -29,6 +29,9 @@ struct HTTPRequest {
   HTTPHeaders
       headers;  // control characters are removed from values; "Content-Length" is always the body's own
   std::string body;
+  // Posts of one sequence to one host begin in order: each when the one before it has ended, or a second
+  // after it came, for a host that is slow. 0: none.
+  std::uintptr_t sequence = 0;
   std::chrono::milliseconds timeout{60'000};  // total; connecting alone at most 10 s
   // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.
   std::uint32_t leastBytesPerSecond = 0;
@@ -53,6 +56,7 @@ struct HTTPError {
   };
   Kind kind = Kind::transport;
   std::string description;  // one line, a system text: "Could not resolve host: x"
+  int status = 0;           // of an answer that then was cut; 0: none came
 };
 
 using HTTPResult = Result<HTTPResponse, HTTPError>;

@@ -14,7 +14,7 @@ void HTTPWaiting::add(Transfer transfer) {
   queue.push_back(std::move(transfer));
 }
 
-HTTPWaiting::Transfer HTTPWaiting::next() {
+HTTPWaiting::Transfer HTTPWaiting::next(CurlTransfer::Time now) {
   if (!_storebags.empty()) return popFront(_storebags);
   if (!_uploads.empty() && _uploadsRunning < kUploads) {
     Host& host = _hosts[_uploads.front()->host()];
@@ -25,17 +25,32 @@ HTTPWaiting::Transfer HTTPWaiting::next() {
     }
   }
   for (auto& [name, host] : _hosts) {
-    if (host.posts.empty() || host.running >= kPostConnections) continue;
+    if (host.running >= kPostConnections) continue;
+    const auto found = host.firstInTurn(now);
+    if (found == host.posts.end()) continue;
+    Transfer post = std::move(*found);
+    host.posts.erase(found);
     ++host.running;
-    return popFront(host.posts);
+    if (post->sequence() != 0) ++host.runningOfSequence[post->sequence()];
+    return post;
   }
   return nullptr;
+}
+
+HTTPWaiting::Queue::iterator HTTPWaiting::Host::firstInTurn(CurlTransfer::Time now) {
+  return std::find_if(posts.begin(), posts.end(), [this, now](const Transfer& post) {
+    return post->sequence() == 0 || runningOfSequence.count(post->sequence()) == 0 ||
+           post->arrived() + kLongestInOrder <= now;
+  });
 }
 
 void HTTPWaiting::ended(const CurlTransfer& transfer) {
   if (transfer.lane() == Lane::storebag) return;
   if (transfer.lane() == Lane::upload) --_uploadsRunning;
   const auto found = _hosts.find(transfer.host());
+  auto& sequences = found->second.runningOfSequence;
+  const auto sequence = sequences.find(transfer.sequence());
+  if (sequence != sequences.end() && --sequence->second == 0) sequences.erase(sequence);
   if (--found->second.running == 0 && found->second.posts.empty()) _hosts.erase(found);
 }
 

@@ -1,7 +1,9 @@
 // The requests that may not use a connection yet: which one is next, which has waited too long. HTTP thread.
 #pragma once
 
+#include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <functional>
 #include <map>
@@ -13,9 +15,9 @@
 
 namespace veltrad::platform {
 
-// Storebags go at once. Uploads run two at a time, in order. Posts and uploads share kPostConnections for
-// each host, so that a host that hangs keeps neither the others nor its own storebags waiting. One thread
-// only.
+// Storebags go at once. Uploads run two at a time, in order. Posts of one sequence begin one after the other,
+// but wait for each other no longer than kLongestInOrder. Posts and uploads share kPostConnections for each
+// host, so that a host that hangs keeps neither the others nor its own storebags waiting. One thread only.
 class HTTPWaiting {
  public:
   using Transfer = std::unique_ptr<CurlTransfer>;
@@ -23,10 +25,11 @@ class HTTPWaiting {
   static constexpr std::size_t kConnections = 8;      // to one host
   static constexpr std::size_t kPostConnections = 6;  // of them; the others are the storebags'
   static constexpr std::size_t kUploads = 2;
+  static constexpr std::chrono::seconds kLongestInOrder{1};
 
   void add(Transfer transfer);
   // The next one that may run, which now counts as running; null: none may.
-  Transfer next();
+  Transfer next(CurlTransfer::Time now);
   // A running one has ended: its place is free.
   void ended(const CurlTransfer& transfer);
 
@@ -40,6 +43,10 @@ class HTTPWaiting {
   struct Host {
     std::size_t running = 0;
     Queue posts;
+    std::map<std::uintptr_t, std::size_t> runningOfSequence;
+
+    // The first of the posts that may begin.
+    Queue::iterator firstInTurn(CurlTransfer::Time now);
   };
 
   static Transfer popFront(Queue& queue);

@@ -82,7 +82,8 @@ void HTTPWorker::end(const HTTPWaiting::Predicate& matches) {
 }
 
 void HTTPWorker::startNext() {
-  while (Transfer transfer = _waiting.next()) startOne(std::move(transfer));
+  const auto now = std::chrono::steady_clock::now();
+  while (Transfer transfer = _waiting.next(now)) startOne(std::move(transfer));
 }
 
 void HTTPWorker::startOne(Transfer transfer) {
@@ -133,7 +134,7 @@ void HTTPWorker::endExpired() {
 }
 
 void HTTPWorker::poll() {
-  constexpr int kCheckWaiting = 1000, kUnwoken = 100,
+  constexpr int kCheckWaiting = 200, kUnwoken = 100,
                 kIdle = 3'600'000;  // ms; libcurl's own timers come first
   const int most = !_wakeable ? kUnwoken : _waiting.empty() ? kIdle : kCheckWaiting;
   _curl.multiPoll(_multi, nullptr, 0, most, nullptr);

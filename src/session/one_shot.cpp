@@ -11,10 +11,9 @@ namespace veltrad {
 
 void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& messageLog,
                                 const OneShotMessage& message) {
-  const std::int32_t number =
-      message.sessionInfo ? message.sessionInfo->int32(kVeltraSessionInfoSessionID).value_or(0) : 0;
-  logDebug("sendMessageWithSessionInfo: Sending single message with sessionID %ld",
-           static_cast<long>(number));
+  const Value* given = message.sessionInfo ? message.sessionInfo->find(kVeltraSessionInfoSessionID) : nullptr;
+  const std::int64_t number = given ? given->toInt64().value_or(0) : 0;
+  logDebug("sendMessageWithSessionInfo: Sending single message with sessionID %ld", long{number});
   if (!message.sessionInfo || !message.storebag) {
     logError("RsendMessageWithSessionInfo: Attempted to send message with one or more nil parameters");
     return;

@@ -66,9 +66,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count("message taken in");
-  if (hasAggregator() || getSessionHierarchy() > 0) {
-    aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
-  }
+  aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
   return offerToBackends(*set, payload, time, category16, type16, flag);
 }
 
@@ -102,11 +100,14 @@ void VeltradSession::aggregateMessage(const SharedDictionary& info, double times
     return all;
   };
   std::optional<std::string> line;
-  // A root has no ancestors, so it needs no look at them and no lock of the registry's.
-  const bool toAncestor = getSessionHierarchy() > 0 &&
-                          _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
-                            line = ancestor.sendToAggregator(info, timestamp, category, type, merged());
-                          });
+  bool toAncestor = false;
+  if (!userInfo()) {
+    logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", sessionID());
+  } else if (getSessionHierarchy() > 0) {  // a root has no ancestors, so it takes no lock of the registry's
+    toAncestor = _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
+      line = ancestor.sendToAggregator(info, timestamp, category, type, merged());
+    });
+  }
   if (!toAncestor && hasAggregator()) {
     line = sendToAggregator(info, timestamp, category, type, merged());
   }
@@ -210,8 +211,7 @@ void VeltradSession::uploadLogData(Array logData, UploadLogDataReply completionH
 void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, OptionalDictionary userInfo,
                                                 std::uint16_t category, std::uint16_t type,
                                                 OptionalDictionary payload, StringReply reply) {
-  if (!info || !info->contains(kVeltraSessionInfoClientType) ||
-      !info->contains(kVeltraSessionInfoSessionID)) {
+  if (!info || !info->int32(kVeltraSessionInfoClientType) || !info->uint32(kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
     _services.counters.count("message dropped: a one-shot message without client type or session ID");
     return;  // the reply is never given, which ends the client's call

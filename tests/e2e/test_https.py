@@ -430,6 +430,8 @@ class Moods(HTTPSTest):
         ("redirect", {"status": 302, "headers": {"Location": "/events/elsewhere"}}, (None, None), 1),
         ("dripping", {"dripMs": 10, "body": "x" * 20}, (None, None), 1), ("stalled", {"stall": True}, (None, None), 1),
         ("broken", {"status": 503}, (503, "backend httppost disabled by server 503 return code"), 1),
+        ("brokenoff", {"status": 503, "cutHalfway": True, "body": "xxxx"},
+         (503, "backend httppost disabled by server 503 return code"), 1),
         ("cut", {"cut": True}, (-1, "Empty reply from server"), 1),
         ("halfway", {"cutHalfway": True, "body": "xxxx"}, (-1, "transfer closed with 2 bytes remaining to read"), 1),
         ("endless", {"endless": True}, (-1, "The answer is larger than 16777216 bytes"), 1),
@@ -467,10 +469,10 @@ class Moods(HTTPSTest):
                 with self.subTest(mood[0]):
                     self.flush_in_a_mood(daemon, *mood)
             # Each mood: start and message; then, in peace where there is a lab, the second start and the stop.
-            counts = {"event posted": 3 * 2 + 9 * 2, "event lost: the server answered 5xx": 2,
+            counts = {"event posted": 3 * 2 + 10 * 2, "event lost: the server answered 5xx": 4,
                       "event lost: the server answered 4xx": 2,
                       "event lost: the server answered 3xx, and no post follows a redirect": 2,
-                      "event lost: the post failed": 3 * 2 + 3 * 4, "event held: batched": 12 * 4}
+                      "event lost: the post failed": 3 * 2 + 3 * 4, "event held: batched": 13 * 4}
             wait_until(lambda: counts.items() <= self.stats().items(), counts)
         self.assertEqual((self.posts("elsewhere"), stranger.received("events")), ([], []))
 
@@ -480,7 +482,7 @@ class ClosingCollector:
     long enough."""
 
     def __init__(self, lab):
-        self.posts, self._closed = 0, threading.Semaphore(0)
+        self.heads, self._closed = [], threading.Semaphore(0)
         self._tls = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
         self._tls.load_cert_chain(lab.certificate, lab.certificate.replace("certificate.pem", "certificate-key.pem"))
         self._listening = socket.create_server(("localhost", 0))
@@ -497,7 +499,7 @@ class ClosingCollector:
             length = int(re.search(rb"Content-Length: (\d+)", head)[1])
             while len(body) < length:
                 body = self._read(connection, body)
-            self.posts += 1
+            self.heads.append(head.decode().splitlines())
             connection.sendall(b"HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n")
             connection.setblocking(False)
             with contextlib.suppress(ssl.SSLWantReadError):
@@ -529,4 +531,46 @@ class KeptConnections(HTTPSTest):
                 self.assertEqual(client.flush()[1:], (None, None))
                 collector.wait_for_close()
             client.close()
-        self.assertEqual((collector.posts, self.counts()["event posted"]), (5, 6))
+        self.assertEqual((len(collector.heads), self.counts()["event posted"]), (5, 6))
+        names = [line.split(":")[0] for line in collector.heads[-1][1:]]
+        self.assertEqual([name for name in names if name != "Host"], [
+            "X-VLT-Client-Name", "X-VLT-Service-Name", "User-Agent", "X-VLT-Client-Version", "X-VLT-Sender", "Accept",
+            "Content-Type", "Content-Length", "Content-Encoding"])
+
+
+class Order(HTTPSTest):
+    def test_posts_arrive_in_order_but_wait_for_no_slow_collector(self):
+        self.serve(entry(realtime_post_url="${url}/events/phone"))
+        with self.serving():
+            client = self.client(batchEvent=True)
+            for delay, in_order in ((300, True), (5000, False)):
+                self.lab.control(path="/events/phone", times=1, delayMs=delay)
+                before = self.posts("phone")
+                client.message(number=delay)
+                client.message(number=delay + 1, flag=1)
+                batch, alone = [post for post in self.posts("phone", len(before) + 2) if post not in before]
+                if alone["body"]["events"][0].get("number") != delay + 1:  # which came is said when it was answered
+                    batch, alone = alone, batch
+                apart = alone["time"] - batch["time"]
+                self.assertTrue(0.3 <= apart < 2.5 if in_order else 0.9 <= apart < 4, apart)
+            self.lab.reset()
+            client.close()
+
+    def test_the_limit_counts_by_the_event_s_own_method(self):
+        self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
+        with self.serving():
+            client = self.client(batchEvent=True)
+            flushed = [client.message(category=category) for category in (5, 6, 7)]
+            self.assertEqual([reply is None for reply in flushed], [True, True, False])
+            client.close()
+
+    def test_a_single_message_names_its_client_by_numbers(self):
+        self.serve(entry())
+        with self.serving("sendMessageWithSessionInfo: "):
+            client = self.client()
+            for info in ({"clientType": 7, "sessionID": "1"}, {"clientType": "7", "sessionID": 1}, {"clientType": 7}):
+                client.begin("sendMessageWithSessionInfo:userInfo:category:type:payload:reply:", sessionInfo=info,
+                             userInfo={"clientName": "phone", "serviceName": "x"}, category=5, type=2, payload={})
+                self.assertIn("gave no reply", str(client.frame()[2]))
+            client.close()
+            self.posts("phone", 2)

@@ -74,7 +74,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* paylo
   const bool userInfoMissing = requireUserInfo() && !userInfoDict();
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batchEvents()) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batchEvents(), requireUserInfo());
-    return batchEvent(method, std::move(event));
+    return batchEvent(std::move(event));
   }
   return postEvent(std::move(event), realtime, method, respCode, flag);
 }
@@ -130,7 +130,9 @@ void HTTPSPostBackend::filterEvent(Dictionary& event) const {
   if (outcome.hashed > 0) _services.counters.count("event field hashed: by a filter", outcome.hashed);
 }
 
-std::optional<std::string> HTTPSPostBackend::batchEvent(std::uint16_t method, Dictionary event) {
+std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event) {
+  // The event's own: user info and filters may have changed it.
+  const std::int32_t method = event.int32("_method").value_or(0);
   std::optional<std::string> flushed;
   bool reached = false;
   bool full = false;
@@ -251,6 +253,7 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
     return;
   }
   platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
+  request.sequence = reinterpret_cast<std::uintptr_t>(this);
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
   _services.http.start(std::move(request),
                        [self, postedTo = *url, eventCount,
@@ -262,16 +265,17 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
 
 std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result,
                                                              const std::string& url, std::size_t eventCount) {
+  std::optional<ReportingError> error;
   if (!result.ok()) {
     const std::string& description = result.error().description;
     logError("HTTPSPostBackend(postJsonMessage): post error: %s (%s)", description.c_str(), url.c_str());
-    _services.counters.count(reasonOf(result.error().kind), eventCount);
-    return makeReportingError(description, -1);
+    error = makeReportingError(description, -1);
   }
-  const int status = result.value().status;
+  const int status = result.ok() ? result.value().status : result.error().status;
   const PostVerdict verdict = verdictOfStatus(status);
-  _services.counters.count(verdict.reason, eventCount);
-  if (!verdict.disablesBackend) return std::nullopt;
+  const bool answered = result.ok() || verdict.disablesBackend;
+  _services.counters.count(answered ? verdict.reason : reasonOf(result.error().kind), eventCount);
+  if (!verdict.disablesBackend) return error;
   const std::string text = fmt::sprintf("backend %s disabled by server %d return code", name(), status);
   logInfo("postJSONMessage: %s", text.c_str());
   setState(kBackendDisabled);

@@ -55,7 +55,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   Dictionary withStopFields(const Dictionary* payload) const;
   void prepareEventForMessage(Dictionary& event) const;
   void filterEvent(Dictionary& event) const;
-  std::optional<std::string> batchEvent(std::uint16_t method, Dictionary event);
+  std::optional<std::string> batchEvent(Dictionary event);
   std::optional<std::string> postEvent(Dictionary event, bool realtime, std::uint16_t method,
                                        std::uint16_t respCode, std::int32_t flag);
   // The compact JSON; `pretty` gets the readable copy where logging is allowed.

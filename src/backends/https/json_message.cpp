@@ -1,9 +1,12 @@
 // Envelope making.
 #include "backends/https/json_message.h"
 
+#include <fmt/format.h>
+
 #include <cmath>
 
 #include "base/json.h"
+#include "base/text.h"
 #include "platform/log.h"
 
 namespace veltrad {
@@ -30,6 +33,15 @@ Fate fateOf(const Value& value) {
   return Fate::remove;
 }
 
+// For a log line, which need not hold a mebibyte.
+std::string printed(const Value& value) {
+  constexpr std::size_t kMost = 1024;
+  if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
+  std::string text = writeJSON(value);
+  if (text.size() <= kMost) return text;
+  return std::string(withoutIncompleteEnd(std::string_view(text).substr(0, kMost))) + "…";
+}
+
 double finiteOrMinusOne(double seconds) {
   return std::isfinite(seconds) ? seconds : -1.0;
 }
@@ -43,7 +55,7 @@ std::size_t restrictEventForJSON(Dictionary& event) {
     if (fate == Fate::remove) {
       logWarning(
           "HTTPSPostBackend(createMessageForPostAndLogging): Quillfen unable to handle key: %s, value: %s",
-          key.c_str(), writeJSON(value).substr(0, 256).c_str());
+          key.c_str(), printed(value).c_str());
     }
     changed.emplace_back(key, value);
   }
