@@ -7,6 +7,7 @@
 #include <array>
 #include <cctype>
 #include <string_view>
+#include <utility>
 
 #include "base/text.h"
 
@@ -107,6 +108,7 @@ bool CurlTransfer::setHeaders(CURL* easy) {
   _headerList = HeaderList(nullptr, _curl->slistFreeAll);
   // What libcurl would add by itself, unless the request has its own.
   std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
+  bool lengthSaid = false;  // in its place among the others; what the request says of it does not count
   const auto append = [this](const std::string& line) {
     curl_slist* longer = _curl->slistAppend(_headerList.get(), line.c_str());
     if (longer == nullptr) return false;
@@ -119,7 +121,12 @@ bool CurlTransfer::setHeaders(CURL* easy) {
     const auto is = [given](const char* other) { return equalIgnoringCase(given, other); };
     if (!isToken(given) || is("Transfer-Encoding") || is("Expect")) continue;
     for (auto& [automatic, found] : own) found = found || is(automatic);
-    if (!append(headerLine(name, is("Content-Length") ? std::to_string(_bodySize) : value))) return false;
+    if (is("Content-Length")) {
+      if (std::exchange(lengthSaid, true)) continue;
+      if (!append(headerLine("Content-Length", std::to_string(_bodySize)))) return false;
+    } else if (!append(headerLine(name, value))) {
+      return false;
+    }
   }
   for (const auto& [automatic, found] : own) {
     if (!found && !append(std::string(automatic) + ":")) return false;
