@@ -4,7 +4,6 @@
 #include <sys/socket.h>
 
 #include <filesystem>
-#include <future>
 
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/dashboard/log_data_uploads.h"
@@ -130,18 +129,6 @@ TEST_F(Dashboard, AProfileThatNamesNoServerMakesNone) {
     refused(Dictionary{{"ip", ip}, {"port", 9}}, "can't resolve server IP");
   }
   refused(Dictionary{{"ip", "255.255.255.255"}, {"port", 9}}, "socket connect() failed.");
-}
-
-TEST_F(Dashboard, LogDataIsBoundedInAllAndNeedsAnAddress) {
-  const Array large{std::string(LogDataUploads::kMostBytes / 2, 'x')};
-  const auto backend = make({{"post_url", "https://l.example/logs"}});
-  auto first = std::async(std::launch::async, [&] { return backend->uploadLogData(large); });
-  EXPECT_TRUE(world.http.waitForRequest());
-  log.expectLine(Level::error, "array (Too many log data uploads under way)");
-  EXPECT_FALSE(make({{"post_url", "https://l.example/"}})->uploadLogData(large));
-  EXPECT_TRUE(world.http.answerNext(FakeHTTPClient::response(200, "/logs/124")) && first.get());
-  log.expectLine(Level::error, "DashboardBackend(uploadLogData): Post URL for log data array is nil");
-  EXPECT_FALSE(make()->uploadLogData(large));
 }
 
 TEST_F(Dashboard, ManyBackEndsShareTwoThreadsAndTheEndCountsWhatWaits) {

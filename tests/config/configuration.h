@@ -41,7 +41,7 @@ struct Configuration {
     files.put(root.publicKeyPath(), RSAKey::shared().encoded());
   }
   void answers(std::string body, platform::HTTPHeaders headers = {}, int status = 200) {
-    answer = FakeHTTPClient::response(status, std::move(body), std::move(headers));
+    answer = platform::HTTPResponse{status, std::move(headers), std::move(body)};
   }
 
   platform::Root root{"/"};
@@ -52,7 +52,7 @@ struct Configuration {
   ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   Veltra veltra{files, preferences, root};
   platform::HTTPResult answer =
-      FakeHTTPClient::error(platform::HTTPError::Kind::transport, "Could not resolve host: bags.test");
+      Failure{platform::HTTPError{platform::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
   std::vector<platform::HTTPRequest> requests;  // those that were answered
   FakeHTTPClient client{[this](const platform::HTTPRequest& request) {
     requests.push_back(request);

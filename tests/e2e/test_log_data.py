@@ -44,3 +44,20 @@ class LogData(SystemTest):
             self.assertIn("Nobody took", said)
         for data, problem in (("[1", "logs.json: not JSON"), ("{}", "expected an array, found an object")):
             self.assertIn(problem, self.upload(data, status=2)[1])
+
+    def test_bounds(self):
+        self.lab.put("quindle", storebag(backends=DASHBOARD))
+        self.lab.put("ostvane", storebag(backends={"dashboard": {**DASHBOARD["dashboard"], "post_url": 7}}))
+        large = ["x" * (33 << 20)]  # two of them are more than is kept at once
+        with self.serving("array (Too many log data uploads under way)", "Post URL for log data array is nil",
+                          "Log data array upload failed") as daemon:
+            first, _ = self.open()
+            other, _ = self.open(6)
+            self.assertFalse(other.ask("uploadLogData", data=[1])["uploaded"])
+            self.lab.control(path="/logdata", stall=True)
+            first.say(op="uploadLogData", data=large)
+            self.lab.received("logdata", 1)
+            self.upload(large, status=1)
+            daemon.wait_for_line("Too many log data uploads under way")
+            self.lab.reset()
+            self.assertTrue(first.answer()["uploaded"])
