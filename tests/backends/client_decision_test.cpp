@@ -1,4 +1,4 @@
-// The borders of the decision on a client entry, of its lists and of its filters; the rest of the tables is
+// The borders of the decision on a client entry and of its filters; the rest of the tables is
 // played by real processes.
 #include "backends/https/client_decision.h"
 
@@ -6,7 +6,6 @@
 
 #include "backends/backend.h"
 #include "backends/https/filter_table.h"
-#include "backends/https/text_lists.h"
 #include "base/json.h"
 
 namespace veltrad {
@@ -41,19 +40,6 @@ TEST(ClientDecision, HoldsAtItsBorders) {
     const ClientVerdict verdict = decideOnClient(entry, who);
     EXPECT_EQ(verdict.state, state) << writeJSON(changes);
     EXPECT_EQ(verdict.refusal, refusal) << writeJSON(changes);
-  }
-}
-
-TEST(TextLists, MatchNamesAsClientEntriesDo) {
-  using Name = std::optional<std::string>;
-  const std::tuple<Value, Value, Name, Name, bool> cases[] = {
-      {0, 0, {}, {}, true},           {"a,b", 0, "A", "x", true},
-      {"a,b", 0, "ab", "x", false},   {"a, b", 0, "b", "x", false},  // items are not trimmed
-      {"a", 0, {}, "x", false},       {0, "cam", "a", "FrontCamera", true},
-      {"a", "cam", "a", "no", false}, {"ÄPFEL", "öl", "äpfel", "HEIZÖL", true}};
-  for (const auto& [clients, services, client, service, expected] : cases) {
-    const Dictionary entry{{"client", clients}, {"service", services}};
-    EXPECT_EQ(matchClientNameAndServiceID(entry, client, service), expected) << writeJSON(entry);
   }
 }
 

