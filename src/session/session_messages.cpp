@@ -66,7 +66,9 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count("message taken in");
-  aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
+  if (hasAggregator() || getSessionHierarchy() > 0) {
+    aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
+  }
   return offerToBackends(*set, payload, time, category16, type16, flag);
 }
 
@@ -100,14 +102,11 @@ void VeltradSession::aggregateMessage(const SharedDictionary& info, double times
     return all;
   };
   std::optional<std::string> line;
-  bool toAncestor = false;
-  if (!userInfo()) {
-    logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", sessionID());
-  } else if (getSessionHierarchy() > 0) {  // a root has no ancestors, so it takes no lock of the registry's
-    toAncestor = _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
-      line = ancestor.sendToAggregator(info, timestamp, category, type, merged());
-    });
-  }
+  // A root has no ancestors, so it needs no look at them and no lock of the registry's.
+  const bool toAncestor = getSessionHierarchy() > 0 &&
+                          _sessionDelegate.withAncestorAggregator(*this, [&](VeltradSession& ancestor) {
+                            line = ancestor.sendToAggregator(info, timestamp, category, type, merged());
+                          });
   if (!toAncestor && hasAggregator()) {
     line = sendToAggregator(info, timestamp, category, type, merged());
   }
