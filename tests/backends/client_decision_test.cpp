@@ -16,7 +16,7 @@ TEST(ClientDecision, HoldsAtItsBorders) {
   ClientFacts nowhere = facts, nothing = facts;
   nowhere.country.reset();
   nothing.hardwareType.reset();
-  const Value equal(0.3), below(0.25), text("1");
+  const Value equal(0.3), below(0.25);
   const auto country = [](Value threshold) {
     return Array{Dictionary{{"country", Array{"FR"}}, {"threshold", 0.0}},
                  Dictionary{{"country", Array{"AT", "DE"}}, {"threshold", std::move(threshold)}},
@@ -26,8 +26,6 @@ TEST(ClientDecision, HoldsAtItsBorders) {
   const std::tuple<Dictionary, ClientFacts, std::int32_t, ClientRefusal> cases[] = {
       {{}, nowhere, 2, none},
       {{{"device_blacklist", Array{"x"}}}, nothing, 1, deviceListed},
-      {{{"filters", "none"}}, facts, 1, filtersMissing},
-      {{{"sampling_threshold", text}}, facts, 1, thresholdMissing},
       {{{"sampling_threshold", equal}}, facts, 2, none},
       {{{"sampling_threshold", below}}, facts, 3, none},
       {{{"sampling_threshold", below}, {"override_sampling", 0.29}}, facts, 1, sampledOut},

@@ -1,4 +1,4 @@
-// What real processes do not show of uploads: a file that changes while it is read, and odd names.
+// What real processes do not show of uploads: how far a file is read that changes meanwhile.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -6,7 +6,6 @@
 #include <fstream>
 
 #include "backends/upload/file_snapshot.h"
-#include "backends/upload/upload_request.h"
 #include "fakes/temporary_directory.h"
 #include "platform/file_descriptor.h"
 
@@ -35,24 +34,6 @@ TEST(FileSnapshot, EndsWhereTheFileEndedAtFirst) {
   auto emptied = FileSnapshot::of(file.get());
   ASSERT_EQ(::ftruncate(file.get(), 0), 0);
   EXPECT_EQ(emptied->content(), FileSnapshot::Content::none);
-}
-
-TEST(UploadRequest, NamesTheFileByItsLastComponent) {
-  const std::pair<const char*, const char*> cases[] = {{"/var/log/a?b/c d", "c%20d.gz"},
-                                                       {"what?", "what?.gz"},
-                                                       {"/dir//", "dir.gz"},
-                                                       {"//", "/.gz"},
-                                                       {"", ".gz"},
-                                                       {"[x]\"\n", "%5Bx%5D%22%0A.gz"}};
-  for (const auto& [path, name] : cases) {
-    const auto request = uploadRequest("https://u.example/f", {"", 4294967295u}, path, "z");
-    ASSERT_TRUE(request) << path;
-    EXPECT_EQ(request->url,
-              std::string("https://u.example/f?uuid=&sequence=4294967295&description=Callwyn%20QBSL%20log%20"
-                          "(Uploaded%20by%20PKV)&filename=") +
-                  name + "&raw=true");
-  }
-  EXPECT_FALSE(uploadRequest("https://u.example/\n", {}, "a", "z"));
 }
 
 }  // namespace

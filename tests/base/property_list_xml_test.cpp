@@ -1,7 +1,6 @@
 // XML property lists: every element, what is written, what is refused and where.
 #include <gtest/gtest.h>
 
-#include <clocale>
 #include <cmath>
 
 #include "base/property_list.h"

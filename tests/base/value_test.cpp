@@ -43,12 +43,6 @@ TEST(Value, readsNumbersByOneRule) {
   }
 }
 
-TEST(Value, comparesByContent) {
-  for (const auto& [a, b] : {std::pair<Value, Value>(-1, UINT64_MAX), {1, 1.0}, {1, true}, {Data{"a"}, "a"}})
-    EXPECT_FALSE(a == b);
-  EXPECT_TRUE(Value(Array{1, Dictionary{{"a", 2}}}) == Value(Array{1u, Dictionary{{"a", 2u}}}));
-}
-
 TEST(Dictionary, keepsKeysInOrder) {
   Dictionary dictionary{{"b", 1}, {"a", 2}, {"b", 3}};
   dictionary.set("aa", 4);

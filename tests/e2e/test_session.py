@@ -40,10 +40,10 @@ class Sessions(HTTPSTest):
                 self.lab.control(path="/events/two", status=status)
                 client.begin("flushMessagesWithCompletion:")
                 daemon.wait_for_line("internalFlushMessagesWithCompletion: httppost2", round)
-                for other in range(1000, 1020 if error is None else 1000):  # a flush that was answered would come first
-                    client.send(client.CALL, {"op": "fetchDisplayURL:", "args": {}}, other)
-                    self.assertEqual(client.frame()[1], other)
                 if error is None:
+                    for other in range(1000, 1020):  # a flush that was answered would come before these
+                        client.send(client.CALL, {"op": "fetchDisplayURL:", "args": {}}, other)
+                        self.assertEqual(client.frame()[1], other)
                     self.lab.reset()
                 answer = client.expect()
                 self.lab.reset()
@@ -65,8 +65,7 @@ class Sessions(HTTPSTest):
         self.root.write("etc/veltrad/device.plist", {**DEVICE, "ReleaseType": "Internal", "SerialNumber": ""})
         self.root.write("var/lib/veltrad/preferences/com.florn.timed.plist", {"TMAutomaticTimeZoneEnabled": False})
         with self.serving(env={"LANG": "C"}):
-            self.lab.put("quindle", storebag(locale_whitelist=[], override_dnu=1, client="phone"))
-            self.serve(entry(post_url="${url}/events"), display_url="x")
+            self.serve(entry())
             self.client().close()
             start, _ = self.lab.wait_for_events(2)
         expected = {"SerialNum": "Unknown", "Version": "12.1", "Build": "21B74", "Hardware": "E42", "Product": "Elm",

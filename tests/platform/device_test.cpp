@@ -39,16 +39,6 @@ TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
   EXPECT_EQ(_properties.value("ReleaseType"), Text());
 }
 
-TEST_F(MachinePropertiesTest, AMalformedListIsOneLineAChangeAndTheMachineIsAsked) {
-  _files.put("/etc/os-release", "VERSION_ID=12\n");
-  for (const char* bytes : {"rubbish", "other rubbish"}) {
-    _files.put(kList, bytes);
-    _log.expectLine(LogLevel::error,
-                    "Device properties could not be read, the machine is asked: " + std::string(kList));
-    for (int i = 0; i < 2; ++i) EXPECT_EQ(_properties.value("ProductVersion"), "12");
-  }
-}
-
 TEST_F(MachinePropertiesTest, AsksDMIThenTheDeviceTree) {
   for (const char* key : {"ProductVersion", "ProductType", "UniqueDeviceID", "ReleaseType", "unheard of"})
     EXPECT_EQ(_properties.value(key), Text()) << key;

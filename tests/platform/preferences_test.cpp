@@ -1,7 +1,6 @@
 // Preference domains over real files and over a disk with faults.
 #include "platform/preferences.h"
 
-#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <set>

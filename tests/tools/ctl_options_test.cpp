@@ -10,7 +10,6 @@ namespace veltrad::ctl {
 namespace {
 
 using testing::HasSubstr;
-using testing::Not;
 
 // Words end at each space, so a space at the end gives an empty one.
 std::variant<Options, Ending> parse(std::string line) {
