@@ -7,7 +7,6 @@
 #include "fakes/recorded_log.h"
 #include "fakes/wire.h"
 #include "ipc/listener.h"
-#include "protocol/constants.h"
 
 namespace veltrad::ipc_test {
 
