@@ -1,7 +1,6 @@
 // Binary property lists: every object type, what is written, what is refused.
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <numeric>
 #include <sstream>
 
@@ -98,27 +97,6 @@ TEST(BinaryPropertyList, refusesBrokenObjects) {
   expectRefusal(binaryList({container(0xD0, 1, {1, 1}), "\x10\x01"}), Kind::malformed);
   expectRefusal(binaryList({container(0xA0, 1, {0})}), Kind::cyclic);
   expectRefusal(binaryList({container(0xA0, 1, {1}), container(0xC0, 1, {0})}), Kind::cyclic);
-}
-
-TEST(PropertyLists, comeBackInBothForms) {
-  Array many;
-  for (int i = 0; i < 300; ++i) many.push_back(i);  // more objects than one byte of reference reaches
-  const Value value = Dictionary{
-      {"ints", Array{0, 255, 256, 65535, 65536, 4294967296, -1, INT64_MIN, INT64_MAX, UINT64_MAX}},
-      {"reals", Array{0.0, -0.1, 1e300, HUGE_VAL}},
-      {"a<b>&\"\r\n", Array{"", " ", "x\ty", std::string(70'000, 'b'), "\u00e9", "\U0001F600"}},
-      {"data", Array{Data{""}, Data{std::string(300, '\xFF')}, Data{"\0\xFF"s}}},
-      {"\u00fcber",
-       Dictionary{{"dates", Array{Date{0}, Date{-62167219200}, Date{253402300799}}}, {"yes", true}}},
-      {"", Dictionary{{"none", Array{}}, {"no", false}}},
-      {"many", many}};
-  std::string binary = "header";
-  appendBinaryPropertyList(value, binary);
-  for (const std::string& bytes : {binary.substr(6), writeXMLPropertyList(value)}) {
-    const auto read = parsePropertyList(bytes);
-    ASSERT_TRUE(read.ok()) << read.error().detail;
-    EXPECT_TRUE(read.value() == value);
-  }
 }
 
 TEST(PropertyListLimits, holdExactlyInBothForms) {

@@ -97,14 +97,7 @@ TEST(JSON, saysWhatIsWrongAndWhere) {
   }
 }
 
-TEST(JSON, writesWhatItReads) {
-  const Value value = Dictionary{{"a\"\n", Array{1, -1, UINT64_MAX, 0.1, 2.0, true, "\u00e9"}},
-                                 {"d", Array{Date{1.25}, Data{"\xFF"}, Dictionary{}, Array{}}}};
-  for (const JSONStyle style : {JSONStyle::compact, JSONStyle::pretty}) {
-    const auto read = parseJSON(writeJSON(value, style));
-    ASSERT_TRUE(read.ok()) << read.error().detail;
-    EXPECT_TRUE(read.value() == value);
-  }
+TEST(JSON, isWrittenInOrderAndMended) {
   EXPECT_EQ(writeJSON(Dictionary{{"b", Array{1, 2.0}}, {"a", "x"}}), R"({"a":"x","b":[1,2.0]})");
   EXPECT_EQ(writeJSON(Dictionary{{"a", 1}}, JSONStyle::pretty), "{\n  \"a\": 1\n}");
   EXPECT_EQ(writeJSON(Array{NAN, HUGE_VAL, "a\xFF"}), "[null,null,\"a\uFFFD\"]");
