@@ -29,8 +29,8 @@ struct HTTPRequest {
   HTTPHeaders
       headers;  // control characters are removed from values; "Content-Length" is always the body's own
   std::string body;
-  // Posts of one sequence to one host begin in order: each when the one before it has ended, or a second
-  // after it came, for a host that is slow. 0: none.
+  // Posts of one sequence to one host begin in order: each when the one before it has ended, but 100 ms after
+  // it came at the latest, so that a slow host takes several at once. 0: none.
   std::uintptr_t sequence = 0;
   std::chrono::milliseconds timeout{60'000};  // total; connecting alone at most 10 s
   // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.

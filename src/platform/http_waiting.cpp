@@ -38,9 +38,12 @@ HTTPWaiting::Transfer HTTPWaiting::next(CurlTransfer::Time now) {
 }
 
 HTTPWaiting::Queue::iterator HTTPWaiting::Host::firstInTurn(CurlTransfer::Time now) {
-  return std::find_if(posts.begin(), posts.end(), [this, now](const Transfer& post) {
-    return post->sequence() == 0 || runningOfSequence.count(post->sequence()) == 0 ||
-           post->arrived() + kLongestInOrder <= now;
+  std::uintptr_t busy = 0;  // mostly all that wait are of one sequence: it is looked up once
+  return std::find_if(posts.begin(), posts.end(), [&](const Transfer& post) {
+    const bool waits = post->sequence() == busy || runningOfSequence.count(post->sequence()) > 0;
+    if (post->sequence() == 0 || !waits || post->arrived() + kLongestInOrder <= now) return true;
+    busy = post->sequence();
+    return false;
   });
 }
 

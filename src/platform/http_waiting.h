@@ -25,7 +25,7 @@ class HTTPWaiting {
   static constexpr std::size_t kConnections = 8;      // to one host
   static constexpr std::size_t kPostConnections = 6;  // of them; the others are the storebags'
   static constexpr std::size_t kUploads = 2;
-  static constexpr std::chrono::seconds kLongestInOrder{1};
+  static constexpr std::chrono::milliseconds kLongestInOrder{100};
 
   void add(Transfer transfer);
   // The next one that may run, which now counts as running; null: none may.

@@ -134,7 +134,7 @@ void HTTPWorker::endExpired() {
 }
 
 void HTTPWorker::poll() {
-  constexpr int kCheckWaiting = 200, kUnwoken = 100,
+  constexpr int kCheckWaiting = 50, kUnwoken = 100,
                 kIdle = 3'600'000;  // ms; libcurl's own timers come first
   const int most = !_wakeable ? kUnwoken : _waiting.empty() ? kIdle : kCheckWaiting;
   _curl.multiPoll(_multi, nullptr, 0, most, nullptr);
