@@ -42,8 +42,7 @@ std::optional<std::string> distrust(const std::string& path) {
                   static_cast<unsigned>(status.st_mode & 07777));
     return part + facts +
            "; expected the file and every directory above it to be owned by root or the daemon's own user "
-           "and "
-           "writable by nobody else";
+           "and writable by nobody else";
   }
   return S_ISREG(status.st_mode) ? std::nullopt : std::optional(path + ": not a regular file");
 }

@@ -19,6 +19,12 @@ int localPortOf(curl_socket_t socket) {
   if (address.ss_family == AF_INET6) return ntohs(reinterpret_cast<const sockaddr_in6&>(address).sin6_port);
   return -1;
 }
+
+bool somethingWaits(curl_socket_t socket) {
+  char byte = 0;
+  const ssize_t length = recv(socket, &byte, 1, MSG_PEEK | MSG_DONTWAIT);
+  return length >= 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR);
+}
 }  // namespace
 
 curl_socket_t KeptConnections::open(const curl_sockaddr& address) {
@@ -34,12 +40,10 @@ int KeptConnections::close(void* self, curl_socket_t socket) {
 }
 
 bool KeptConnections::ended(int localPort) const {
-  const auto found = std::find_if(_sockets.begin(), _sockets.end(),
-                                  [localPort](curl_socket_t s) { return localPortOf(s) == localPort; });
-  if (found == _sockets.end()) return false;
-  char byte = 0;
-  const ssize_t length = recv(*found, &byte, 1, MSG_PEEK | MSG_DONTWAIT);
-  return length >= 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR);
+  // Connections to different servers may share a local port; in doubt a new one is made.
+  return std::any_of(_sockets.begin(), _sockets.end(), [localPort](curl_socket_t socket) {
+    return localPortOf(socket) == localPort && somethingWaits(socket);
+  });
 }
 
 }  // namespace veltrad::platform
