@@ -18,8 +18,9 @@
 namespace veltrad {
 
 namespace platform {
+class MemoryAccount;
 class Random;
-}
+}  // namespace platform
 
 using SharedDictionary = std::shared_ptr<const Dictionary>;
 
@@ -88,6 +89,9 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   void setIsInternal(bool value) { _isInternal = value; }
   bool requireUserInfo() const { return _requireUserInfo; }
   void setRequireUserInfo(bool value) { _requireUserInfo = value; }
+  // Whom what it keeps is charged to; null: nobody.
+  const std::shared_ptr<platform::MemoryAccount>& memoryAccount() const { return _memoryAccount; }
+  void setMemoryAccount(std::shared_ptr<platform::MemoryAccount> value) { _memoryAccount = std::move(value); }
   double startTimeStamp() const { return _startTimeStamp; }  // seconds since 1970
   std::uint8_t selfVersionMajor() const { return _selfVersionMajor; }
   std::uint8_t selfVersionMinor() const { return _selfVersionMinor; }
@@ -130,6 +134,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   bool _isInternal = false;
   bool _requireUserInfo = false;
   double _startTimeStamp = 0;
+  std::shared_ptr<platform::MemoryAccount> _memoryAccount;
   std::uint8_t _selfVersionMajor = 0;
   std::uint8_t _selfVersionMinor = 0;
 

@@ -252,4 +252,45 @@ std::optional<double> Dictionary::real(std::string_view key) const {
   return value ? value->toDouble() : std::nullopt;
 }
 
+std::size_t keptBytes(const std::string& text) {
+  // A short text stands in its own object.
+  static const std::size_t kInPlace = std::string().capacity();
+  return text.capacity() > kInPlace ? blockBytes(text.capacity() + 1) : 0;
+}
+
+namespace {
+// An object made by make_shared, with its two counts.
+template <typename T>
+constexpr std::size_t sharedBytes() {
+  return blockBytes(sizeof(T) + 2 * sizeof(void*));
+}
+}  // namespace
+
+std::size_t keptBytes(const Value& value) {
+  switch (value.type()) {
+    case Value::Type::string:
+      return keptBytes(*value.asString());
+    case Value::Type::data:
+      return sharedBytes<Data>() + keptBytes(value.asData()->bytes);
+    case Value::Type::array:
+      return sharedBytes<Array>() + keptBytes(*value.asArray());
+    case Value::Type::dictionary:
+      return sharedBytes<Dictionary>() + keptBytes(*value.asDictionary());
+    default:
+      return 0;
+  }
+}
+
+std::size_t keptBytes(const Array& array) {
+  std::size_t bytes = blockBytes(array.capacity() * sizeof(Value));
+  for (const Value& value : array) bytes += keptBytes(value);
+  return bytes;
+}
+
+std::size_t keptBytes(const Dictionary& dictionary) {
+  std::size_t bytes = blockBytes(dictionary.capacity() * sizeof(Dictionary::Entry));
+  for (const auto& [key, value] : dictionary) bytes += keptBytes(key) + keptBytes(value);
+  return bytes;
+}
+
 }  // namespace veltrad

@@ -117,6 +117,7 @@ class Dictionary {
   void merge(const Dictionary& other);
 
   std::size_t size() const { return _entries.size(); }
+  std::size_t capacity() const { return _entries.capacity(); }
   bool empty() const { return _entries.empty(); }
   const_iterator begin() const { return _entries.begin(); }
   const_iterator end() const { return _entries.end(); }
@@ -137,5 +138,16 @@ class Dictionary {
   std::vector<Entry>::iterator place(std::string_view key);
   std::vector<Entry> _entries;
 };
+
+// What malloc gives away for a block of that many bytes; 0 for none.
+constexpr std::size_t blockBytes(std::size_t bytes) {
+  return bytes == 0 ? 0 : bytes <= 24 ? 32 : (bytes + 8 + 15) / 16 * 16;
+}
+std::size_t keptBytes(const std::string& text);
+// The memory that a value or dictionary keeps beside its own object. What it shares with others counts in
+// full. Linear in what it holds.
+std::size_t keptBytes(const Value& value);
+std::size_t keptBytes(const Dictionary& dictionary);
+std::size_t keptBytes(const Array& array);
 
 }  // namespace veltrad

@@ -108,7 +108,7 @@ int main() {
 
   Daemon daemon(services);
   Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
-                     services.root.entitlementsPath()},
+                     services.memory, services.root.entitlementsPath()},
                     daemon.agent());
   if (!listener.resume()) return 1;
   services.serviceManager.ready();

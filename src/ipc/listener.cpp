@@ -52,6 +52,7 @@ Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
       _entitlements(options.entitlements),
       _lentFiles(options.lentFiles),
       _counters(options.counters),
+      _memory(options.memory),
       _entitlementsPath(std::move(options.entitlementsPath)),
       _mostConnections(options.mostConnections),
       _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
@@ -180,7 +181,8 @@ void Listener::admit(FileDescriptor socket) {
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
   auto connection = std::make_shared<ipc::SocketConnection>(
-      number, std::move(socket), std::move(peer.value()), _entitlements, _lentFiles, _counters, _budget);
+      number, std::move(socket), std::move(peer.value()), _entitlements, _lentFiles, _counters, _budget,
+      _memory.accountOf(uid));
   if (connection->usable() && startClient(number, uid, connection)) return;
   _counters.count("connection refused: no thread or descriptor is left");
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");

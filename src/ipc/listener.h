@@ -16,6 +16,7 @@
 #include "platform/entitlements.h"
 #include "platform/file_descriptor.h"
 #include "platform/lent_files.h"
+#include "platform/memory_budget.h"
 #include "protocol/connection.h"
 
 namespace veltrad {
@@ -29,6 +30,7 @@ struct ListenerOptions {
   platform::Entitlements& entitlements;
   platform::LentFiles& lentFiles;
   platform::Counters& counters;
+  platform::MemoryBudget& memory;
   std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
   std::size_t mostConnections = 4096;
   std::size_t mostConnectionsOfOneUser = 1024;
@@ -85,6 +87,7 @@ class Listener {
   platform::Entitlements& _entitlements;
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
+  platform::MemoryBudget& _memory;
   const std::string _entitlementsPath;
   const std::size_t _mostConnections;
   const std::size_t _mostConnectionsOfOneUser;

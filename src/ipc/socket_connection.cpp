@@ -34,10 +34,12 @@ std::string refusalFrame(const std::string& description) {
 
 SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
                                    platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
-                                   platform::Counters& counters, ReadBudget& budget)
+                                   platform::Counters& counters, ReadBudget& budget,
+                                   std::shared_ptr<platform::MemoryAccount> account)
     : _out(std::make_shared<OutQueue>(std::move(socket), counters)),
       _peer(std::move(peer)),
       _description(describe(number, _peer)),
+      _account(std::move(account)),
       _entitlements(entitlements),
       _lentFiles(lentFiles),
       _counters(counters),

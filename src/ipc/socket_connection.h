@@ -25,7 +25,8 @@ class SocketConnection final : public Connection, public std::enable_shared_from
  public:
   SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
                    platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
-                   platform::Counters& counters, ReadBudget& budget);
+                   platform::Counters& counters, ReadBudget& budget,
+                   std::shared_ptr<platform::MemoryAccount> account);
 
   // False: the system had no wake-up descriptor for it.
   bool usable() const { return _out->usable(); }
@@ -40,6 +41,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   void stop(std::chrono::steady_clock::time_point deadline);
 
   std::string description() const override { return _description; }
+  std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return _account; }
   std::optional<Value> valueForEntitlement(std::string_view name) override;
   void setExportedObject(std::shared_ptr<ClientSessionInterface> session) override {
     _session = std::move(session);
@@ -74,6 +76,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   const std::shared_ptr<OutQueue> _out;
   const platform::Peer _peer;
   const std::string _description;
+  const std::shared_ptr<platform::MemoryAccount> _account;
   platform::Entitlements& _entitlements;
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;

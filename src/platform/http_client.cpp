@@ -90,8 +90,9 @@ CurlHTTPClient::~CurlHTTPClient() {
   if (_impl->wake()) _impl->thread.join();
 }
 
-void CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
+std::optional<HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
   _impl->file(std::move(request), std::move(completion), false);
+  return std::nullopt;
 }
 
 HTTPResult CurlHTTPClient::perform(HTTPRequest request) {

@@ -12,16 +12,24 @@
 #include <vector>
 
 #include "base/result.h"
+#include "platform/file_descriptor.h"
+#include "platform/memory_budget.h"
 
 namespace veltrad::platform {
 
 using HTTPHeaders = std::vector<std::pair<std::string, std::string>>;
 
+// A body that is read from a file's beginning as it is sent.
+struct FileBody {
+  std::shared_ptr<const FileDescriptor> file;
+  std::uint64_t bytes = 0;
+};
+
 struct HTTPRequest {
   enum class Method { get, post };
-  // What bounds apply. Storebag requests are always admitted; event posts share 1,024 requests and 64 MiB;
-  // uploads run two at a time, others wait.
-  enum class Lane { storebag, event, upload };
+  // What bounds apply. Storebag requests are always admitted; at most 1,024 event posts are under way; three
+  // file uploads run at a time and three of log data, others wait.
+  enum class Lane { storebag, event, upload, logData };
 
   Method method = Method::get;
   Lane lane = Lane::event;
@@ -29,6 +37,12 @@ struct HTTPRequest {
   HTTPHeaders
       headers;  // control characters are removed from values; "Content-Length" is always the body's own
   std::string body;
+  std::optional<FileBody> fileBody;  // instead of `body`
+  // What the request and its completion keep, charged by its maker; paid back after the completion has run.
+  Charge charge;
+  // False: the answer's body is thrown away as it comes, and one that is too large ends the connection but
+  // not the request: its status counts.
+  bool keepsAnswer = true;
   // Posts of one sequence to one host begin in order: each when the one before it has ended, but 100 ms after
   // it came at the latest, so that a slow host takes several at once. 0: none.
   std::uintptr_t sequence = 0;
@@ -52,6 +66,7 @@ struct HTTPError {
   enum class Kind {
     transport,  // refused, unresolvable, not trusted, cut, timed out, too large; not https
     tooMany,    // over the lane's bound; nothing was sent
+    shortage,   // no descriptor, thread or memory for it just now; nothing was sent
     stopping,   // the daemon is stopping
   };
   Kind kind = Kind::transport;
@@ -65,8 +80,9 @@ using HTTPCompletion = std::function<void(HTTPResult)>;
 class HTTPClient {
  public:
   virtual ~HTTPClient() = default;
-  // `completion` runs exactly once, never inside this call.
-  virtual void start(HTTPRequest request, HTTPCompletion completion) = 0;
+  // Nothing: `completion` will run exactly once, never inside this call. Else it was not taken (tooMany,
+  // shortage) and the completion never runs.
+  [[nodiscard]] virtual std::optional<HTTPError> start(HTTPRequest request, HTTPCompletion completion) = 0;
   // Waits for the answer on the caller's thread; fails at once with `stopping` after failBlockingWaits().
   virtual HTTPResult perform(HTTPRequest request) = 0;
   // perform() fails at once: work that leads to one can be given up.
@@ -83,7 +99,7 @@ class CurlHTTPClient final : public HTTPClient {
  public:
   explicit CurlHTTPClient(HTTPClientSettings settings);
   ~CurlHTTPClient() override;  // ends every transfer with `stopping`, then joins
-  void start(HTTPRequest request, HTTPCompletion completion) override;
+  std::optional<HTTPError> start(HTTPRequest request, HTTPCompletion completion) override;
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 

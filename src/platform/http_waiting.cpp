@@ -10,7 +10,7 @@ using Lane = HTTPRequest::Lane;
 
 void HTTPWaiting::add(Transfer transfer) {
   Host* host = transfer->lane() == Lane::storebag ? nullptr : &_hosts[transfer->host()];
-  Queue& queue = host == nullptr ? _storebags : transfer->lane() == Lane::upload ? _uploads : host->posts;
+  Queue& queue = host == nullptr ? _storebags : transfer->lane() == Lane::upload || transfer->lane() == Lane::logData ? _uploads : host->posts;
   queue.push_back(std::move(transfer));
 }
 
@@ -49,7 +49,7 @@ HTTPWaiting::Queue::iterator HTTPWaiting::Host::firstInTurn(CurlTransfer::Time n
 
 void HTTPWaiting::ended(const CurlTransfer& transfer) {
   if (transfer.lane() == Lane::storebag) return;
-  if (transfer.lane() == Lane::upload) --_uploadsRunning;
+  if (transfer.lane() == Lane::upload || transfer.lane() == Lane::logData) --_uploadsRunning;
   const auto found = _hosts.find(transfer.host());
   auto& sequences = found->second.runningOfSequence;
   const auto sequence = sequences.find(transfer.sequence());

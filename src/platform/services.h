@@ -11,6 +11,7 @@
 #include "platform/http_client.h"
 #include "platform/lent_files.h"
 #include "platform/locale.h"
+#include "platform/memory_budget.h"
 #include "platform/preferences.h"
 #include "platform/random.h"
 #include "platform/root.h"
@@ -33,6 +34,7 @@ struct Services {
         http({root.extraCertificatesPath()}) {}
 
   const Root root;
+  MemoryBudget memory;
   SystemClock clock;
   UnseededSequence random;
   DiskFileStore files;

@@ -13,6 +13,10 @@
 
 namespace veltrad {
 
+namespace platform {
+class MemoryAccount;
+}
+
 // Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's
 // own thread reads frames and runs calls and handlers, one at a time. remoteObjectProxyWithErrorHandler: any
 // thread.
@@ -21,6 +25,8 @@ class Connection {
   virtual ~Connection() = default;
 
   virtual std::string description() const = 0;
+  // Whom what is kept for this client is charged to; null: nobody.
+  virtual std::shared_ptr<platform::MemoryAccount> memoryAccount() const = 0;
   virtual std::optional<Value> valueForEntitlement(std::string_view name) = 0;
   virtual void setExportedObject(std::shared_ptr<ClientSessionInterface> session) = 0;
   // A frame of whole length that held no readable call; the connection goes on.

@@ -48,6 +48,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, co
     backend->setUserInfoDict(userInfo);
     backend->setSelfVersion(selfVersion);
     backend->setStartTimestamp(start);
+    backend->setMemoryAccount(making.account);
     made->emplace(name, backend);
   }
   return made;

@@ -16,7 +16,8 @@ class DeviceIdentity;
 class Veltra;
 namespace platform {
 class Clock;
-}
+class MemoryAccount;
+}  // namespace platform
 
 // By name; the order of the names' bytes is the order in which backends are asked.
 using BackendSet = std::map<std::string, std::shared_ptr<VeltraBackend>, std::less<>>;
@@ -26,6 +27,7 @@ struct BackendMaking {
   DeviceIdentity& device;
   const Veltra& library;
   platform::Clock& clock;
+  std::shared_ptr<platform::MemoryAccount> account = nullptr;
 };
 
 // One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,

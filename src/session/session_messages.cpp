@@ -132,9 +132,7 @@ std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictiona
     _services.counters.count("event dropped: the client has gone");
   }
   if (!failure) return std::nullopt;
-  const double now = platform::timevalToSeconds(_services.clock.now());
-  const Lock held(_mutex);
-  return _drops.dropped(*failure, now);
+  return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + *failure);
 }
 
 std::optional<std::string> VeltradSession::shutdownSessionAggregation() {
@@ -233,7 +231,8 @@ void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, Optiona
   }
   _services.counters.count("message taken in: one-shot");
   veltrad::sendMessageWithSessionInfo(
-      {_services.factory, _services.device, _services.library, _services.clock}, _services.messageLog,
+      {_services.factory, _services.device, _services.library, _services.clock, _account},
+      _services.messageLog,
       {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
   if (reply) reply("finished");
 }

@@ -49,6 +49,7 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
     : _services(services),
       _sessionDelegate(delegate),
       _sessionIDString(std::move(sessionIDString)),
+      _account(connection ? connection->memoryAccount() : nullptr),
       _connection(std::move(connection)) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
@@ -129,8 +130,9 @@ void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandl
 void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   const SharedDictionary info = sessionInfo();
-  auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock},
-                             &storebag, info.get(), userInfo(), deviceID());
+  auto made =
+      createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
+                     &storebag, info.get(), userInfo(), deviceID());
   if (made) {
     for (const auto& [name, backend] : *made) backend->setCombinedSessionIDString(_sessionIDString);
   }
@@ -274,12 +276,7 @@ void VeltradSession::updateCombinedSessionID() {
 }
 
 void VeltradSession::sayDroppedCopies() {
-  std::optional<std::string> line;
-  {
-    const Lock held(_mutex);
-    line = _drops.rest();
-  }
-  if (line) logError("%s", line->c_str());
+  if (const auto line = _dropLine.rest()) logError("%s", line->c_str());
 }
 
 void VeltradSession::end() {

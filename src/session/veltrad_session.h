@@ -13,9 +13,9 @@
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
+#include "platform/limited_line.h"
 #include "protocol/client_session_interface.h"
 #include "session/backend_set.h"
-#include "session/drop_lines.h"
 
 namespace veltrad {
 
@@ -26,6 +26,7 @@ class VeltradSessionDelegate;
 namespace platform {
 class Counters;
 class Locale;
+class MemoryAccount;
 class Preferences;
 }  // namespace platform
 
@@ -126,8 +127,9 @@ class VeltradSession final : public ClientSessionInterface,
   // Constant after construction.
   const SessionServices _services;
   VeltradSessionDelegate& _sessionDelegate;
-  const std::string _sessionIDString;  // base64 of 16 random bytes
-  char _deviceid[41] = {};             // NUL-terminated; all zero when the device has no identifier
+  const std::string _sessionIDString;                       // base64 of 16 random bytes
+  const std::shared_ptr<platform::MemoryAccount> _account;  // null: nobody pays
+  char _deviceid[41] = {};  // NUL-terminated; all zero when the device has no identifier
 
   // The connection's thread only.
   std::optional<Array> _frameworks;  // kept, not interpreted
@@ -141,7 +143,9 @@ class VeltradSession final : public ClientSessionInterface,
   SharedDictionary _userInfo GUARDED_BY(_mutex);
   std::shared_ptr<const BackendSet> _backends GUARDED_BY(_mutex);
   std::optional<std::string> _storebagVersion GUARDED_BY(_mutex);
-  DropLines _drops GUARDED_BY(_mutex);  // of copies to this session's own client
+
+  // Any thread.
+  platform::LimitedLine _dropLine{"copies"};  // of copies to this session's own client
 };
 
 }  // namespace veltrad

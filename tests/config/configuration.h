@@ -54,8 +54,8 @@ struct Configuration {
   platform::HTTPResult answer =
       Failure{platform::HTTPError{platform::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
   std::vector<platform::HTTPRequest> requests;  // those that were answered
-  FakeHTTPClient client{[this](const platform::HTTPRequest& request) {
-    requests.push_back(request);
+  FakeHTTPClient client{[this](platform::HTTPRequest request) {
+    requests.push_back(std::move(request));
     return answer;
   }};
 };

@@ -19,6 +19,7 @@ namespace {
 
 // A connection without a socket: the test asks and ends it.
 struct FakeConnection final : Connection {
+  std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return nullptr; }
   std::string description() const override { return "connection under test"; }
   std::optional<Value> valueForEntitlement(std::string_view) override { return true; }
   void setExportedObject(std::shared_ptr<ClientSessionInterface> object) override {

@@ -12,13 +12,16 @@ namespace veltrad {
 
 class FakeHTTPClient final : public platform::HTTPClient {
  public:
-  using Answerer = std::function<platform::HTTPResult(const platform::HTTPRequest&)>;
+  using Answerer = std::function<platform::HTTPResult(platform::HTTPRequest)>;
   explicit FakeHTTPClient(Answerer answerer = nullptr) : _answerer(std::move(answerer)) {}
 
-  void start(platform::HTTPRequest request, platform::HTTPCompletion) override {
+  std::optional<platform::HTTPError> start(platform::HTTPRequest request, platform::HTTPCompletion) override {
     ADD_FAILURE() << "a post to " << request.url;
+    return std::nullopt;
   }
-  platform::HTTPResult perform(platform::HTTPRequest request) override { return _answerer(request); }
+  platform::HTTPResult perform(platform::HTTPRequest request) override {
+    return _answerer(std::move(request));
+  }
 
  private:
   const Answerer _answerer;

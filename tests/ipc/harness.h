@@ -76,7 +76,7 @@ class Door : public ListenerDelegate {
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
     _listener = std::make_unique<Listener>(
-        ipc::ListenerOptions{std::move(socket.value()), _entitlements, lentFiles, counters,
+        ipc::ListenerOptions{std::move(socket.value()), _entitlements, lentFiles, counters, memory,
                              root.entitlementsPath(), most, mostOfOneUser, readBudget},
         *this);
     EXPECT_TRUE(_listener->resume());
@@ -103,6 +103,7 @@ class Door : public ListenerDelegate {
   const TemporaryRoot root;
   RecordedLog log;
   platform::Counters counters;
+  platform::MemoryBudget memory;
   Journal journal;
   RecordingSession::OnMessage onMessage;  // given to each session made afterwards
 

@@ -22,6 +22,8 @@ const char* reasonOf(platform::HTTPError::Kind kind) {
       return "event lost: the post failed";
     case platform::HTTPError::Kind::tooMany:
       return "event lost: too many posts under way";
+    case platform::HTTPError::Kind::shortage:
+      return "event lost: no descriptor, thread or memory for its post";
     case platform::HTTPError::Kind::stopping:
       return "event lost: the daemon stopped before the post ended";
   }
@@ -255,12 +257,13 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
   platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
   request.sequence = reinterpret_cast<std::uintptr_t>(this);
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
-  _services.http.start(std::move(request),
-                       [self, postedTo = *url, eventCount,
-                        completion = std::move(completion)](const platform::HTTPResult& result) {
-                         auto error = self->handleAnswer(result, postedTo, eventCount);
-                         if (completion) completion(std::nullopt, std::move(error));
-                       });
+  const auto answered = [self, postedTo = *url, eventCount,
+                         completion = std::move(completion)](const platform::HTTPResult& result) {
+    auto error = self->handleAnswer(result, postedTo, eventCount);
+    if (completion) completion(std::nullopt, std::move(error));
+  };
+  if (auto refusal = _services.http.start(std::move(request), answered))
+    answered(Failure{std::move(*refusal)});
 }
 
 std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result,
