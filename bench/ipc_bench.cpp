@@ -129,10 +129,10 @@ void compare(const char* name, int core) {
   platform::Entitlements entitlements(files, "/nonexistent");
   platform::LentFiles lentFiles;
   platform::Counters counters;
-  ipc::ReadBudget budget;
   Ends served;
-  const auto connection = std::make_shared<ipc::SocketConnection>(
-      1, std::move(served.server), platform::Peer{}, entitlements, lentFiles, counters, budget);
+  const auto connection =
+      std::make_shared<ipc::SocketConnection>(1, std::move(served.server), platform::Peer{}, entitlements,
+                                              lentFiles, counters, platform::MemoryBudget().accountOf(0));
   connection->setExportedObject(std::make_shared<EchoingSession>());
   connection->resume();
   std::thread serving([&] { connection->run(); });

@@ -31,7 +31,8 @@ typedef enum veltra_status {
   VELTRA_INVALID = 4,        /* an argument is not what it must be; nothing was done */
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
-  VELTRA_TOO_LARGE = 7,      /* the call does not fit a frame (1 MiB; log data 64 MiB); nothing was sent */
+  VELTRA_TOO_LARGE = 7, /* the call does not fit a frame (1 MiB, log data 16 MiB; 100,000 keys and values);
+                           nothing was sent */
 } veltra_status;
 
 /* A short English text for a status; static. */
@@ -212,8 +213,9 @@ VELTRA_API veltra_status veltra_session_upload_file(veltra_session*, const char*
                                                     void* context);
 VELTRA_API veltra_status veltra_session_upload_file_wait(veltra_session*, const char* path,
                                                          veltra_reply** reply);
-/* `data` is an array, borrowed, of at most 64 MiB and 500,000 values. The answer, which comes when the
- * servers have answered, says with veltra_reply_uploaded whether anybody took it; it has no error of its own.
+/* `data` is an array, borrowed, of at most 16 MiB and 100,000 keys and values. The answer, which comes when
+ * the servers have answered, says with veltra_reply_uploaded whether anybody took it; it has no error of its
+ * own.
  */
 VELTRA_API veltra_status veltra_session_upload_log_data(veltra_session*, const veltra_value* data,
                                                         veltra_callback, void* context);

@@ -54,7 +54,8 @@ class BackendFactory {
 
 class StandardBackendFactory final : public BackendFactory {
  public:
-  explicit StandardBackendFactory(BackendServices services) : _services(services), _logData(services.http) {}
+  explicit StandardBackendFactory(BackendServices services)
+      : _services(services), _logData(services.http, services.counters) {}
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType) override;

@@ -35,6 +35,7 @@ enum class LockRank : int {
   session = 40,
   backend = 50,
   leaf = 100,
+  memory = 102,  // of those who wait for memory, which is paid back under any lock
 };
 
 // The same order for the compiler: each level stands between two ranks, and a lock of a rank says on which

@@ -3,6 +3,8 @@
 // version 1.0.
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -19,6 +21,7 @@ struct PropertyListLimits {
   int depth = 64;                    // nesting of arrays and dictionaries, the outermost being 1
   std::size_t objects = 65'536;      // values made, a shared object counted at each place where it stands
   std::size_t textBytes = 6u << 20;  // bytes of all keys, texts and data made, shared ones at each place
+  std::size_t memory = static_cast<std::size_t>(-1);  // keptBytes() of the value made; the binary form alone
 };
 
 struct PropertyListError {
@@ -26,7 +29,8 @@ struct PropertyListError {
     notAPropertyList,  // neither form
     malformed,         // the form is broken; detail says where
     tooDeep,
-    tooLarge,  // bytes, objects or text beyond the limits
+    tooLarge,    // bytes, objects or text beyond the limits
+    overMemory,  // what is made would keep more than the limit: more of it may do
     cyclic,
     forbidden,  // XML: a document type with an internal subset, an entity, an external reference
   };
@@ -41,6 +45,11 @@ Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
                                                          const PropertyListLimits& limits = {});
 Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes,
                                                       const PropertyListLimits& limits = {});
+
+// The objects that the trailer of a binary list counts, shared ones once; nothing: there is no such trailer.
+std::optional<std::uint64_t> declaredObjects(std::string_view bytes);
+// As the limits count them: the value, and the keys and values of all containers in it, each where it stands.
+std::size_t objectsIn(const Value& value);
 
 // Texts that are no UTF-8 are mended, each wrong byte becoming U+FFFD.
 std::string writeBinaryPropertyList(const Value& value);

@@ -27,11 +27,21 @@ std::uint64_t bigEndian(const char* at, std::size_t size) {
   return number;
 }
 
+// Of a text that was given its length at once; a short one stands in its own object.
+std::size_t textBlock(std::size_t length) {
+  static const std::size_t kInPlace = std::string().capacity();
+  return length > kInPlace ? blockBytes(length + 1) : 0;
+}
+
 // Reads one list. On the caller's stack; the bytes outlive it.
 class Reader {
  public:
   Reader(std::string_view bytes, const PropertyListLimits& limits)
-      : _bytes(bytes), _objectsLeft(limits.objects), _textLeft(limits.textBytes), _depthLimit(limits.depth) {}
+      : _bytes(bytes),
+        _objectsLeft(limits.objects),
+        _textLeft(limits.textBytes),
+        _memoryLeft(limits.memory),
+        _depthLimit(limits.depth) {}
 
   Result<Value, PropertyListError> read() {
     Value value(false);
@@ -79,6 +89,7 @@ class Reader {
   bool readTrailer();
   bool charge(std::uint64_t objects);
   bool chargeText(std::uint64_t bytes);
+  bool chargeMemory(std::uint64_t bytes);
   bool locate(std::uint64_t number, Object& object);
   bool takeCount(Object& object, std::uint64_t& count);
   bool take(Object& object, std::uint64_t count, std::size_t width, std::string_view& bytes);
@@ -102,6 +113,7 @@ class Reader {
   const std::string_view _bytes;
   std::uint64_t _objectsLeft;
   std::uint64_t _textLeft;
+  std::uint64_t _memoryLeft;
   const int _depthLimit;
   std::size_t _offsetSize = 0;
   std::size_t _referenceSize = 0;
@@ -150,6 +162,13 @@ bool Reader::charge(std::uint64_t objects) {
 bool Reader::chargeText(std::uint64_t bytes) {
   if (bytes > _textLeft) return fail(Kind::tooLarge, "more bytes of texts and data than the limit");
   _textLeft -= bytes;
+  return true;
+}
+
+// Before the memory is taken.
+inline bool Reader::chargeMemory(std::uint64_t bytes) {
+  if (bytes > _memoryLeft) return fail(Kind::overMemory, "its values need more memory than the limit");
+  _memoryLeft -= bytes;
   return true;
 }
 
@@ -277,7 +296,10 @@ bool Reader::readUID(Object& object, Value& value) {
 bool Reader::readData(Object& object, Value& value) {
   std::uint64_t count = 0;
   std::string_view bytes;
-  if (!takeCount(object, count) || !take(object, count, 1, bytes) || !chargeText(count)) return false;
+  if (!takeCount(object, count) || !take(object, count, 1, bytes) || !chargeText(count) ||
+      !chargeMemory(sharedBytes<Data>() + textBlock(count))) {
+    return false;
+  }
   value = Value(Data{std::string(bytes)});
   return true;
 }
@@ -289,13 +311,13 @@ bool Reader::readText(Object& object, std::string& text) {
   if (!takeCount(object, count) || !take(object, count, wide ? 2 : 1, bytes)) return false;
   if (!wide) {
     if (!isASCII(bytes)) return malformed(object, "a byte above 127 in an ASCII text");
-    if (!chargeText(count)) return false;
+    if (!chargeText(count) || !chargeMemory(textBlock(count))) return false;
     text.assign(bytes);
     return true;
   }
   if (count > _textLeft) return chargeText(count);
   const std::size_t length = utf8LengthOfUTF16(bytes);
-  if (!chargeText(length)) return false;
+  if (!chargeText(length) || !chargeMemory(textBlock(length))) return false;
   text.reserve(length);
   forEachUTF16Character(bytes, [&](char32_t code) { appendUTF8(text, code); });
   return true;
@@ -316,7 +338,8 @@ bool Reader::readArray(Object& object, const Path* path, int depth, Value& value
   std::string_view references;
   // The children are paid for before room is made for them.
   if (!enter(object, path, depth) || !takeCount(object, count) ||
-      !take(object, count, _referenceSize, references) || !charge(count)) {
+      !take(object, count, _referenceSize, references) || !charge(count) ||
+      !chargeMemory(sharedBytes<Array>() + blockBytes(count * sizeof(Value)))) {
     return false;
   }
   const Path here{object.number, path};
@@ -337,7 +360,8 @@ bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& 
   std::uint64_t count = 0;
   std::string_view references;
   if (!enter(object, path, depth) || !takeCount(object, count) ||
-      !take(object, count, 2 * _referenceSize, references) || !charge(2 * count)) {
+      !take(object, count, 2 * _referenceSize, references) || !charge(2 * count) ||
+      !chargeMemory(sharedBytes<Dictionary>() + blockBytes(count * sizeof(Dictionary::Entry)))) {
     return false;
   }
   const Path here{object.number, path};
@@ -373,6 +397,11 @@ Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
         Kind::tooLarge, fmt::format("{} bytes, at most {} are read", bytes.size(), limits.bytes)}};
   }
   return Reader(bytes, limits).read();
+}
+
+std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
+  if (!bytes.starts_with(kHeader) || bytes.size() < kHeader.size() + kTrailerSize) return std::nullopt;
+  return bigEndian(bytes.data() + bytes.size() - kTrailerSize + 8, 8);
 }
 
 }  // namespace veltrad

@@ -9,8 +9,8 @@
 namespace veltrad {
 
 Value::Value(Data data) : _held(std::make_shared<const Data>(std::move(data))) {}
-Value::Value(Array array) : _held(std::make_shared<const Array>(std::move(array))) {}
-Value::Value(Dictionary dictionary) : _held(std::make_shared<const Dictionary>(std::move(dictionary))) {}
+Value::Value(Array array) : _held(std::make_shared<Array>(std::move(array))) {}
+Value::Value(Dictionary dictionary) : _held(std::make_shared<Dictionary>(std::move(dictionary))) {}
 
 const Data* Value::asData() const {
   const auto* held = std::get_if<std::shared_ptr<const Data>>(&_held);
@@ -25,6 +25,24 @@ const Array* Value::asArray() const {
 const Dictionary* Value::asDictionary() const {
   const auto* held = std::get_if<std::shared_ptr<const Dictionary>>(&_held);
   return held ? held->get() : nullptr;
+}
+
+namespace {
+// What nobody else holds may be moved out: it was made as an object that may change.
+template <typename T>
+std::optional<T> takenFrom(std::shared_ptr<const T>* held) {
+  if (!held) return std::nullopt;
+  if (held->use_count() == 1) return std::move(const_cast<T&>(**held));
+  return **held;
+}
+}  // namespace
+
+std::optional<Dictionary> Value::takeDictionary() && {
+  return takenFrom(std::get_if<std::shared_ptr<const Dictionary>>(&_held));
+}
+
+std::optional<Array> Value::takeArray() && {
+  return takenFrom(std::get_if<std::shared_ptr<const Array>>(&_held));
 }
 
 bool Value::isNumber() const {
@@ -199,6 +217,14 @@ bool Dictionary::erase(std::string_view key) {
   return true;
 }
 
+std::optional<Value> Dictionary::take(std::string_view key) {
+  const auto at = place(key);
+  if (at == _entries.end() || at->first != key) return std::nullopt;
+  std::optional<Value> taken = std::move(at->second);
+  _entries.erase(at);
+  return taken;
+}
+
 void Dictionary::merge(const Dictionary& other) {
   std::vector<Entry> both;
   both.reserve(_entries.size() + other._entries.size());
@@ -257,14 +283,6 @@ std::size_t keptBytes(const std::string& text) {
   static const std::size_t kInPlace = std::string().capacity();
   return text.capacity() > kInPlace ? blockBytes(text.capacity() + 1) : 0;
 }
-
-namespace {
-// An object made by make_shared, with its two counts.
-template <typename T>
-constexpr std::size_t sharedBytes() {
-  return blockBytes(sizeof(T) + 2 * sizeof(void*));
-}
-}  // namespace
 
 std::size_t keptBytes(const Value& value) {
   switch (value.type()) {

@@ -62,6 +62,10 @@ class Value {
   const Array* asArray() const;
   const Dictionary* asDictionary() const;
 
+  // The content, moved out where nobody shares it, else copied; absent for another type.
+  std::optional<Dictionary> takeDictionary() &&;
+  std::optional<Array> takeArray() &&;
+
   bool isBoolean() const { return type() == Type::boolean; }
   // An integer of either sign, or a real; a boolean is not a number here.
   bool isNumber() const;
@@ -113,6 +117,8 @@ class Dictionary {
   }
   // True when the key was there.
   bool erase(std::string_view key);
+  // Its value, which is then no longer there.
+  std::optional<Value> take(std::string_view key);
   // Adds every entry of `other`, replacing entries of the same key. Linear in both.
   void merge(const Dictionary& other);
 
@@ -142,6 +148,11 @@ class Dictionary {
 // What malloc gives away for a block of that many bytes; 0 for none.
 constexpr std::size_t blockBytes(std::size_t bytes) {
   return bytes == 0 ? 0 : bytes <= 24 ? 32 : (bytes + 8 + 15) / 16 * 16;
+}
+// Of an object made by make_shared, with its two counts.
+template <typename T>
+constexpr std::size_t sharedBytes() {
+  return blockBytes(sizeof(T) + 2 * sizeof(void*));
 }
 std::size_t keptBytes(const std::string& text);
 // The memory that a value or dictionary keeps beside its own object. What it shares with others counts in

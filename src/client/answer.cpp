@@ -3,6 +3,7 @@
 
 #include "base/property_list.h"
 #include "protocol/constants.h"
+#include "protocol/limits.h"
 
 namespace veltrad {
 
@@ -37,7 +38,7 @@ Answer answerOfStatus(veltra_status status, const char* description) {
 }
 
 Answer answerOfReply(std::string_view body) {
-  const auto parsed = parseBinaryPropertyList(body);
+  const auto parsed = parseBinaryPropertyList(body, kDaemonFrameLimits);
   const Dictionary* reply = parsed ? parsed.value().asDictionary() : nullptr;
   if (!reply) return unreadable();
   auto answer = std::make_unique<veltra_reply>();

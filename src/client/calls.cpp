@@ -5,6 +5,7 @@
 #include "base/text.h"
 #include "ipc/frame.h"
 #include "protocol/constants.h"
+#include "protocol/limits.h"
 
 namespace veltrad {
 
@@ -13,16 +14,15 @@ namespace {
 using Entries = std::vector<Dictionary::Entry>;
 
 // What the daemon reads at most, less the frame's own dictionaries around it.
-constexpr int kDeepestArgument = 60;
-constexpr std::size_t kObjectsAround = 100;
-constexpr std::size_t kMostLargeObjects = 500'000;
+constexpr int kDeepestArgument = kMostFrameDepth - 4;
 
 bool absentOrDictionary(const veltra_value* value) {
   return !value || value->entries();
 }
 
-bool fits(const veltra_value* value, std::size_t mostObjects = PropertyListLimits{}.objects) {
-  return !value || (value->depth <= kDeepestArgument && value->objects < mostObjects - kObjectsAround);
+// Before it is made: a value that cannot fit is not even copied.
+bool fits(const veltra_value* value) {
+  return !value || (value->depth <= kDeepestArgument && value->objects <= kMostCallObjects);
 }
 
 std::string mended(const char* text) {
@@ -60,8 +60,13 @@ CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries argume
   body.reserve(2);
   body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
   body.emplace_back("op", operation);
-  std::string frame = ipc::makeFrame(kind, 0, Dictionary::fromEntries(std::move(body)), descriptors);
+  Dictionary whole = Dictionary::fromEntries(std::move(body));
+  std::string frame = ipc::makeFrame(kind, 0, whole, descriptors);
   if (!ipc::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
+  // An object takes a byte at least where it stands, so that only a long frame is worth a count.
+  if (frame.size() > kMostCallObjects && objectsIn(Value(std::move(whole))) > kMostCallObjects) {
+    return {VELTRA_TOO_LARGE, {}};
+  }
   return {VELTRA_OK, std::move(frame)};
 }
 
@@ -134,7 +139,7 @@ std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
 
 CallFrame logDataFrame(const veltra_value* data) {
   if (!data || !data->items()) return {VELTRA_INVALID, {}};
-  if (!fits(data, kMostLargeObjects)) return {VELTRA_TOO_LARGE, {}};
+  if (!fits(data)) return {VELTRA_TOO_LARGE, {}};
   return frameOfKind(ipc::FrameKind::largeCall, kUploadLogData, {{"data", valueOfNode(*data)}});
 }
 

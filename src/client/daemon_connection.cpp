@@ -13,6 +13,7 @@
 
 #include "base/property_list.h"
 #include "client/calls.h"
+#include "protocol/limits.h"
 
 namespace veltrad {
 
@@ -177,7 +178,7 @@ bool DaemonConnection::takeFrames() {
     if (frame.header.kind == ipc::FrameKind::reply && frame.header.callID != 0) {
       _arrived.push_back({frame.header.callID, answerOfReply(frame.body), {}});
     } else if (frame.header.kind == ipc::FrameKind::event) {
-      auto body = parseBinaryPropertyList(frame.body);
+      auto body = parseBinaryPropertyList(frame.body, kDaemonFrameLimits);
       const Dictionary* event = body ? body.value().asDictionary() : nullptr;
       if (event) _arrived.push_back({0, nullptr, *event});
     }

@@ -3,6 +3,8 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
+
 #include "base/property_list.h"
 #include "base/text.h"
 #include "ipc/pending_reply.h"
@@ -11,13 +13,9 @@ namespace veltrad::ipc {
 
 namespace {
 
-// A message of a few hundred fields is far below these; log data is bounded by its frame alone.
-constexpr PropertyListLimits kCallLimits{kFrameBodyLimit, 64, 100'000, 8u << 20};
-constexpr PropertyListLimits kLargeCallLimits{kLargeFrameBodyLimit, 64, 500'000, kLargeFrameBodyLimit};
-
 struct Call {
   ClientSessionInterface& session;
-  const Dictionary& arguments;
+  Dictionary& arguments;  // each is taken out where it is used
   const std::string& extensionToken;
   std::shared_ptr<PendingReply> pending;  // null: no reply is wanted
 };
@@ -29,16 +27,22 @@ Refusal mustBe(const char* argument, const char* type) {
   return fmt::format("argument \"{}\" must be {}", argument, type);
 }
 
-template <typename T>
-std::optional<T> copied(const T* found) {
-  return found ? std::optional<T>(*found) : std::nullopt;
+OptionalDictionary takenDictionary(Call& call, std::string_view name) {
+  auto value = call.arguments.take(name);
+  return value ? std::move(*value).takeDictionary() : std::nullopt;
+}
+
+std::optional<Array> takenArray(Call& call, std::string_view name) {
+  auto value = call.arguments.take(name);
+  return value ? std::move(*value).takeArray() : std::nullopt;
 }
 
 Refusal setSessionInfo(Call& call) {
-  const Dictionary& arguments = call.arguments;
-  call.session.setSessionInfo(
-      copied(arguments.dictionary("sessionInfo")), copied(arguments.dictionary("userInfo")),
-      copied(arguments.array("frameworksToCheck")), arguments.boolean("hasAggregationBlock").value_or(false));
+  const bool aggregates = call.arguments.boolean("hasAggregationBlock").value_or(false);
+  auto sessionInfo = takenDictionary(call, "sessionInfo");
+  auto userInfo = takenDictionary(call, "userInfo");
+  call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
+                              takenArray(call, "frameworksToCheck"), aggregates);
   // Nothing comes back but the word that it was done.
   if (call.pending) call.pending->answer({});
   return std::nullopt;
@@ -50,7 +54,7 @@ Refusal startConfig(Call& call) {
 }
 
 Refusal fetchStates(Call& call) {
-  call.session.fetchStatesWithUserInfo(copied(call.arguments.dictionary("userInfo")),
+  call.session.fetchStatesWithUserInfo(takenDictionary(call, "userInfo"),
                                        namesReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -65,15 +69,15 @@ Refusal sendMessageWithCategory(Call& call) {
   if (!category) return mustBe("category", "a number");
   const auto type = call.arguments.uint16("type");
   if (!type) return mustBe("type", "a number");
-  call.session.sendMessageWithCategory(*category, *type, copied(call.arguments.dictionary("payload")),
+  call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, "payload"),
                                        stringReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithDictionary(Call& call) {
-  const Dictionary* message = call.arguments.dictionary("message");
+  auto message = takenDictionary(call, "message");
   if (!message) return mustBe("message", "a dictionary");
-  call.session.sendMessageWithDictionary(*message, stringReply(std::move(call.pending)));
+  call.session.sendMessageWithDictionary(std::move(*message), stringReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -95,9 +99,9 @@ Refusal uploadFile(Call& call) {
 }
 
 Refusal uploadLogData(Call& call) {
-  const Array* data = call.arguments.array("data");
+  auto data = takenArray(call, "data");
   if (!data) return mustBe("data", "an array");
-  call.session.uploadLogData(*data, uploadLogDataReply(std::move(call.pending)));
+  call.session.uploadLogData(std::move(*data), uploadLogDataReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -106,9 +110,11 @@ Refusal sendMessageWithSessionInfo(Call& call) {
   if (!category) return mustBe("category", "a number");
   const auto type = call.arguments.uint16("type");
   if (!type) return mustBe("type", "a number");
-  call.session.sendMessageWithSessionInfo(
-      copied(call.arguments.dictionary("sessionInfo")), copied(call.arguments.dictionary("userInfo")),
-      *category, *type, copied(call.arguments.dictionary("payload")), stringReply(std::move(call.pending)));
+  auto sessionInfo = takenDictionary(call, "sessionInfo");
+  auto userInfo = takenDictionary(call, "userInfo");
+  call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
+                                          takenDictionary(call, "payload"),
+                                          stringReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -146,54 +152,122 @@ std::string_view shortened(std::string_view text) {
   return text.substr(0, 100);
 }
 
-}  // namespace
-
-Result<Value, std::string> decodeFrameBody(const Frame& frame) {
-  const bool large = frame.header.kind == FrameKind::largeCall;
-  auto parsed = parseBinaryPropertyList(frame.body, large ? kLargeCallLimits : kCallLimits);
+Result<Dictionary, std::string> dictionaryOf(Result<Value, PropertyListError> parsed) {
   if (!parsed) return Failure{"the body is no readable property list: " + parsed.error().detail};
-  if (!parsed.value().asDictionary()) return Failure{std::string("the body must be a dictionary")};
-  return std::move(parsed.value());
+  auto dictionary = std::move(parsed.value()).takeDictionary();
+  if (!dictionary) return Failure{std::string("the body must be a dictionary")};
+  return std::move(*dictionary);
 }
 
-namespace {
+// The memory that a call's values are first thought to need: without shared objects it is enough.
+std::size_t expectedMemory(std::string_view body) {
+  constexpr std::size_t kLeast = 2048, kBytesOfObject = 64;
+  const std::uint64_t objects = std::min<std::uint64_t>(declaredObjects(body).value_or(0), kMostCallObjects);
+  return std::min(kLeast + 2 * body.size() + kBytesOfObject * objects, kMostCallMemory);
+}
+
+// Of a call whose values keep so much: what is copied of them and written on the way counts, too.
+std::size_t chargeOf(std::size_t memory, std::string_view body) {
+  return memory + memory / 2 + 2 * body.size() + 4096;
+}
+
+bool chargeCall(CallMemory& memory, std::size_t bytes) {
+  auto charge = memory.account->tryCharge(bytes, platform::MemoryUse::working);
+  if (!charge) {
+    const auto last = std::chrono::steady_clock::now() + kLongestWaitForMemory;
+    charge = memory.account->waitToCharge(
+        bytes, [&] { return memory.giveUp() || std::chrono::steady_clock::now() >= last; });
+  }
+  if (charge) memory.charge = std::move(*charge);
+  return charge.has_value();
+}
+
+std::string usedUp(CallMemory& memory) {
+  memory.usedUp = true;
+  memory.counters.count("call refused: its user's memory is used up");
+  return fmt::format("the memory that the daemon keeps for uid {} is used up; try again later",
+                     memory.account->uid());
+}
+
+Result<Dictionary, std::string> decodeCall(const Frame& frame, CallMemory& memory) {
+  PropertyListLimits limits{kFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kMostCallMemory};
+  for (limits.memory = expectedMemory(frame.body);; limits.memory = kMostCallMemory) {
+    // Nothing is held while it waits, so that calls never wait for each other in a ring.
+    memory.charge.release();
+    if (memory.account && !chargeCall(memory, chargeOf(limits.memory, frame.body))) {
+      return Failure{usedUp(memory)};
+    }
+    auto parsed = parseBinaryPropertyList(frame.body, limits);
+    const bool more = !parsed && parsed.error().kind == PropertyListError::Kind::overMemory &&
+                      limits.memory < kMostCallMemory;
+    if (!more) return dictionaryOf(std::move(parsed));
+  }
+}
+
+// Its bytes were charged when its header came; it does not wait for more.
+Result<Dictionary, std::string> decodeLargeCall(const Frame& frame, CallMemory& memory) {
+  constexpr std::size_t kBytesOfObject = 64;
+  const std::size_t bytes = memory.charge.bytes();
+  std::size_t objects = std::min<std::uint64_t>(declaredObjects(frame.body).value_or(0), kMostCallObjects);
+  PropertyListLimits limits{kLargeFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kLargeFrameBodyLimit};
+  for (;; objects *= 2) {
+    // Shared objects are found on the way: then it is read again with more.
+    if (frame.refused || (memory.account && !memory.charge.resize(bytes + kBytesOfObject * objects))) {
+      return Failure{usedUp(memory)};
+    }
+    limits.memory = frame.body.size() + 2 * kBytesOfObject * (objects + 1);
+    auto parsed = parseBinaryPropertyList(frame.body, limits);
+    const bool more = !parsed && parsed.error().kind == PropertyListError::Kind::overMemory &&
+                      objects < 8 * kMostCallObjects;
+    if (!more) return dictionaryOf(std::move(parsed));
+    objects = std::max<std::size_t>(objects, 64);
+  }
+}
 
 Refusal runCall(const Frame& frame, ClientSessionInterface& session, const std::string& extensionToken,
-                const std::shared_ptr<PendingReply>& pending) {
+                const std::shared_ptr<PendingReply>& pending, CallMemory& memory) {
   const FrameKind kind = frame.header.kind;
-  if (kind != FrameKind::call && kind != FrameKind::largeCall) {
+  const bool large = kind == FrameKind::largeCall;
+  if (kind != FrameKind::call && !large) {
     return fmt::format(
         "after its hello a client sends frames of kind 2 (call) and 6 (large call), not of kind {}",
         static_cast<unsigned>(kind));
   }
-  const auto decoded = decodeFrameBody(frame);
+  auto decoded = large ? decodeLargeCall(frame, memory) : decodeCall(frame, memory);
   if (!decoded) return decoded.error();
-  const Dictionary& body = *decoded.value().asDictionary();
+  Dictionary& body = decoded.value();
   const std::string* name = body.string("op");
   if (!name) return "\"op\" must be a text";
   const Operation* operation = operationNamed(*name);
   if (!operation) return fmt::format("unknown operation \"{}\"", shortened(*name));
-  if (kind == FrameKind::largeCall && operation->name != kUploadLogData) {
+  if (large && operation->name != kUploadLogData) {
     return fmt::format("a large call is for \"{}\" alone, not for \"{}\"", kUploadLogData, *name);
   }
-  static const Dictionary kNone;
-  const Dictionary* arguments = body.dictionary("args");
-  Call call{session, arguments ? *arguments : kNone, extensionToken, pending};
+  auto given = body.take("args");
+  auto arguments = given ? std::move(*given).takeDictionary() : std::nullopt;
+  if (!arguments) arguments.emplace();
+  Call call{session, *arguments, extensionToken, pending};
   return operation->run(call);
 }
 
 }  // namespace
 
+Result<Dictionary, std::string> decodeFrameBody(const Frame& frame) {
+  return dictionaryOf(parseBinaryPropertyList(
+      frame.body, {kFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kMostCallMemory, kMostCallMemory}));
+}
+
 std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
-                                        const std::shared_ptr<OutQueue>& out,
+                                        const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken) {
   std::shared_ptr<PendingReply> pending;
   if (frame.header.callID != 0) pending = std::make_shared<PendingReply>(out, frame.header.callID);
-  Refusal refusal = runCall(frame, session, extensionToken, pending);
+  Refusal refusal = runCall(frame, session, extensionToken, pending, memory);
   if (refusal && pending) {
-    pending->fail(makeReportingError(fmt::format("The call cannot be read: {}.", toUTF8(*refusal)), -1));
+    const char* what = memory.usedUp ? "The call was not run" : "The call cannot be read";
+    pending->fail(makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));
   }
-  return refusal;
+  return memory.usedUp ? std::nullopt : refusal;
 }
 
 }  // namespace veltrad::ipc

@@ -3,15 +3,13 @@
 
 #include <algorithm>
 #include <cstring>
+#include <new>
 
 #include "base/property_list.h"
 
 namespace veltrad::ipc {
 
 namespace {
-
-// An idle reader keeps no more than this.
-constexpr std::size_t kKeptBytes = 64u << 10;
 
 std::uint32_t readBigEndian(const char* bytes) {
   std::uint32_t number = 0;
@@ -56,17 +54,37 @@ std::string makeFrame(FrameKind kind, std::uint32_t callID, Dictionary body, std
 }
 
 std::pair<char*, std::size_t> FrameReader::room(std::size_t least) {
-  if (_taken == _filled) {
-    _taken = _filled = 0;
-    if (_buffer.size() > kKeptBytes) _buffer = std::string();
-  }
-  if (_buffer.size() - _filled < least && _taken > 0) {
-    std::memmove(_buffer.data(), _buffer.data() + _taken, _filled - _taken);
+  if (_taken == _filled) _taken = _filled = 0;
+  if (_capacity - _filled < least && _taken > 0) {
+    std::memmove(_buffer.get(), _buffer.get() + _taken, _filled - _taken);
     _filled -= _taken;
     _taken = 0;
   }
-  if (_buffer.size() - _filled < least) _buffer.resize(std::max(_filled + least, _filled + _filled / 2));
-  return {_buffer.data() + _filled, _buffer.size() - _filled};
+  if (_capacity - _filled < least && !resizeBuffer(std::max(_filled + least, _filled + _filled / 2))) {
+    return {nullptr, 0};
+  }
+  return {_buffer.get() + _filled, _capacity - _filled};
+}
+
+// To so many bytes, of which what was handed out needs none. While it grows both buffers are there.
+bool FrameReader::resizeBuffer(std::size_t bytes) {
+  if (_memory && bytes > _capacity && !_memory->bufferOf(_capacity + bytes)) return false;
+  std::unique_ptr<char[]> fresh(bytes > 0 ? new (std::nothrow) char[bytes] : nullptr);
+  if (fresh || bytes == 0) {
+    if (_filled > _taken) std::memcpy(fresh.get(), _buffer.get() + _taken, _filled - _taken);
+    _buffer = std::move(fresh);
+    _capacity = bytes;
+    _filled -= _taken;
+    _taken = 0;
+  }
+  if (_memory) _memory->bufferOf(_capacity);
+  return _capacity == bytes;
+}
+
+void FrameReader::rest() {
+  // A frame that still grows keeps the room that it has grown by.
+  const std::size_t wanted = std::max(_filled - _taken, kIdleReadBytes);
+  if (_capacity > wanted + wanted / 2 + kIdleReadBytes) resizeBuffer(wanted);
 }
 
 void FrameReader::received(std::size_t count) {
@@ -75,24 +93,43 @@ void FrameReader::received(std::size_t count) {
 
 FrameReader::Next FrameReader::next(Frame& frame) {
   if (_impossible) return Next::impossible;
+  if (_toSkip) return skip(frame);
   const std::size_t available = _filled - _taken;
   if (available < kFrameHeaderBytes) return Next::needMore;
-  const FrameHeader header = decodeFrameHeader(_buffer.data() + _taken);
+  const FrameHeader header = decodeFrameHeader(_buffer.get() + _taken);
   if (!header.possible()) {
     _impossible = true;
-    frame.header = header;
-    frame.body = {};
+    frame = {header, {}, false};
     return Next::impossible;
   }
+  if (header.kind == FrameKind::largeCall && !_admitted) {
+    if (_memory && !_memory->admitLargeCall(header)) {
+      _skipped = header;
+      _toSkip = header.bodyLength;
+      _taken += kFrameHeaderBytes;
+      return skip(frame);
+    }
+    _admitted = true;
+  }
   if (available - kFrameHeaderBytes < header.bodyLength) return Next::needMore;
-  frame.header = header;
-  frame.body = std::string_view(_buffer).substr(_taken + kFrameHeaderBytes, header.bodyLength);
+  frame = {header, {_buffer.get() + _taken + kFrameHeaderBytes, header.bodyLength}, false};
   _taken += kFrameHeaderBytes + header.bodyLength;
+  _admitted = false;
+  return Next::frame;
+}
+
+FrameReader::Next FrameReader::skip(Frame& frame) {
+  const std::size_t count = std::min(*_toSkip, _filled - _taken);
+  _taken += count;
+  *_toSkip -= count;
+  if (*_toSkip > 0) return Next::needMore;
+  _toSkip.reset();
+  frame = {_skipped, {}, true};
   return Next::frame;
 }
 
 bool FrameReader::inFrame() const {
-  return _filled - _taken >= kFrameHeaderBytes;
+  return _toSkip || _filled - _taken >= kFrameHeaderBytes;
 }
 
 }  // namespace veltrad::ipc

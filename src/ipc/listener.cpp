@@ -57,7 +57,6 @@ Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
       _mostConnections(options.mostConnections),
       _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
       _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
-      _budget(options.readBudget),
       _socket(std::move(options.socket)),
       _spare(openSpare()) {}
 
@@ -180,9 +179,9 @@ void Listener::admit(FileDescriptor socket) {
   const unsigned uid = peer.value().uid;
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
-  auto connection = std::make_shared<ipc::SocketConnection>(
-      number, std::move(socket), std::move(peer.value()), _entitlements, _lentFiles, _counters, _budget,
-      _memory.accountOf(uid));
+  auto connection =
+      std::make_shared<ipc::SocketConnection>(number, std::move(socket), std::move(peer.value()),
+                                              _entitlements, _lentFiles, _counters, _memory.accountOf(uid));
   if (connection->usable() && startClient(number, uid, connection)) return;
   _counters.count("connection refused: no thread or descriptor is left");
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");

@@ -9,7 +9,6 @@
 #include <vector>
 
 #include "base/mutex.h"
-#include "ipc/read_budget.h"
 #include "ipc/service_socket.h"
 #include "ipc/thread.h"
 #include "platform/counters.h"
@@ -34,7 +33,6 @@ struct ListenerOptions {
   std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
   std::size_t mostConnections = 4096;
   std::size_t mostConnectionsOfOneUser = 1024;
-  std::size_t readBudget = ipc::kReadBudget;  // bytes of unfinished frames, all connections together
 };
 
 }  // namespace ipc
@@ -92,9 +90,6 @@ class Listener {
   const std::size_t _mostConnections;
   const std::size_t _mostConnectionsOfOneUser;
   const platform::FileDescriptor _wakeUp;
-
-  // Any thread.
-  ipc::ReadBudget _budget;
 
   // The accepting thread's while it runs, else the owner's.
   ipc::ServiceSocket _socket;

@@ -4,6 +4,7 @@
 #include <sys/eventfd.h>
 #include <sys/socket.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdint>
 
@@ -17,13 +18,17 @@ namespace {
 
 // A client that goes on writing while it is shut out could keep us reading: so many reads at most.
 constexpr int kMostDrainingReads = 1024;
-// An empty queue keeps no more than this.
-constexpr std::size_t kKeptBytes = 16u << 10;
+// What waits, and as much again while it grows.
+constexpr std::size_t kBytesOfByte = 2;
 
 }  // namespace
 
-OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters)
-    : _counters(counters), _readSocket(socket.get()), _readWakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
+OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters,
+                   std::shared_ptr<platform::MemoryAccount> account)
+    : _counters(counters),
+      _account(std::move(account)),
+      _readSocket(socket.get()),
+      _readWakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
   Lock lock(_mutex);
   _socket = std::move(socket);
   _wakeUp = platform::FileDescriptor(_readWakeUp);
@@ -31,7 +36,7 @@ OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters
 }
 
 OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
-  const Sent sent = put(frame, kOutQueueBound + kReplyReserve);
+  const Sent sent = put(frame, Kind::reply);
   if (sent == Sent::full) {
     _counters.count("connection ended: the client does not read its replies");
     requestEnd();
@@ -42,7 +47,7 @@ OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
 }
 
 OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
-  const Sent sent = put(frame, kOutQueueBound);
+  const Sent sent = put(frame, Kind::event);
   if (sent == Sent::full) {
     _counters.count("event dropped: the client does not read");
   } else if (sent == Sent::gone) {
@@ -53,19 +58,24 @@ OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
   return sent;
 }
 
-OutQueue::Sent OutQueue::put(std::string_view frame, std::size_t bound) {
+OutQueue::Sent OutQueue::put(std::string_view frame, Kind kind) {
+  const std::size_t bound = kOutQueueBound + (kind == Kind::reply ? kReplyReserve : 0);
   if (frame.size() > kFrameBodyLimit + kFrameHeaderBytes) return Sent::tooLarge;
+  const std::size_t whole = frame.size();
   Lock lock(_mutex);
   if (_gone) return Sent::gone;
   if (_waiting.empty()) {
     if (!writeSome(frame)) return Sent::gone;
     if (frame.empty()) return Sent::done;
+    // What has begun must be whole, or nothing that follows can be read.
+    const bool begun = frame.size() < whole;
+    if (!charge(frame.size(), kind) && !begun) return Sent::full;
     _waiting.assign(frame);
     _waitingBytes.store(_waiting.size(), std::memory_order_relaxed);
     wake();
     return Sent::done;
   }
-  if (_waiting.size() - _written + frame.size() > bound) return Sent::full;
+  if (_waiting.size() - _written + frame.size() > bound || !charge(frame.size(), kind)) return Sent::full;
   if (_written > _waiting.size() / 2) {
     _waiting.erase(0, _written);
     _written = 0;
@@ -73,6 +83,23 @@ OutQueue::Sent OutQueue::put(std::string_view frame, std::size_t bound) {
   _waiting.append(frame);
   _waitingBytes.store(_waiting.size() - _written, std::memory_order_relaxed);
   return Sent::done;
+}
+
+bool OutQueue::charge(std::size_t bytes, Kind kind) {
+  if (!_account) return true;
+  const bool reply = kind == Kind::reply;
+  auto more = _account->tryCharge(kBytesOfByte * bytes,
+                                  reply ? platform::MemoryUse::working : platform::MemoryUse::kept);
+  if (more) (reply ? _replies : _events).add(std::move(*more));
+  return more.has_value();
+}
+
+// What was written is no longer charged, whichever kind it was.
+void OutQueue::payBack(std::size_t waiting) {
+  const std::size_t wanted = kBytesOfByte * waiting;
+  const std::size_t replies = std::min(_replies.bytes(), wanted);
+  [[maybe_unused]] const bool less =
+      _events.resize(std::min(_events.bytes(), wanted - replies)) && _replies.resize(replies);
 }
 
 // Takes what was written off `bytes`. False: the client has gone.
@@ -120,6 +147,8 @@ void OutQueue::giveUp() {
   _gone = true;
   _waiting = std::string();
   _written = 0;
+  _events.release();
+  _replies.release();
   _waitingBytes.store(0, std::memory_order_relaxed);
 }
 
@@ -130,13 +159,10 @@ std::size_t OutQueue::flush() {
   if (!writeSome(rest)) return 0;
   _written = _waiting.size() - rest.size();
   _waitingBytes.store(rest.size(), std::memory_order_relaxed);
+  payBack(rest.size());
   if (!rest.empty()) return rest.size();
   _written = 0;
-  if (_waiting.capacity() > kKeptBytes) {
-    _waiting = std::string();
-  } else {
-    _waiting.clear();
-  }
+  _waiting = std::string();
   return 0;
 }
 

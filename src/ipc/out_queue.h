@@ -3,12 +3,14 @@
 
 #include <atomic>
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <string_view>
 
 #include "base/mutex.h"
 #include "platform/counters.h"
 #include "platform/file_descriptor.h"
+#include "platform/memory_budget.h"
 
 namespace veltrad::ipc {
 
@@ -21,8 +23,9 @@ inline constexpr std::size_t kReplyReserve = 1u << 20;
 inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
 
 // Job: takes frames from any thread, writes them without blocking and in order, and bounds what a slow reader
-// costs. Owns the socket and the wake-up descriptor. Shared by the connection and by everybody who may still
-// answer or send, so it may outlive the connection; the counters outlive it.
+// costs, in bytes and within what its user may keep. Owns the socket and the wake-up descriptor. Shared by
+// the connection and by everybody who may still answer or send, so it may outlive the connection; the
+// counters outlive it.
 class OutQueue {
  public:
   enum class Sent {
@@ -32,8 +35,9 @@ class OutQueue {
     gone,      // the client has closed, or the connection has ended: dropped
   };
 
-  // Without a socket the client is gone from the start.
-  OutQueue(platform::FileDescriptor socket, platform::Counters& counters);
+  // Without a socket the client is gone from the start. What waits is charged to `account`; null: to nobody.
+  OutQueue(platform::FileDescriptor socket, platform::Counters& counters,
+           std::shared_ptr<platform::MemoryAccount> account);
   OutQueue(const OutQueue&) = delete;
   OutQueue& operator=(const OutQueue&) = delete;
 
@@ -63,13 +67,18 @@ class OutQueue {
   void close();
 
  private:
-  Sent put(std::string_view frame, std::size_t bound);
+  enum class Kind { event, reply };
+
+  Sent put(std::string_view frame, Kind kind);
+  bool charge(std::size_t bytes, Kind kind) REQUIRES(_mutex);
+  void payBack(std::size_t waiting) REQUIRES(_mutex);
   bool writeSome(std::string_view& bytes) REQUIRES(_mutex);
   void giveUp() REQUIRES(_mutex);
   void wake() REQUIRES(_mutex);
 
   // Constant after construction; the connection's own thread alone may use the numbers, until its close().
   platform::Counters& _counters;
+  const std::shared_ptr<platform::MemoryAccount> _account;
   const int _readSocket;
   const int _readWakeUp;
 
@@ -82,7 +91,9 @@ class OutQueue {
   platform::FileDescriptor _wakeUp GUARDED_BY(_mutex);
   bool _gone GUARDED_BY(_mutex) = false;
   std::string _waiting GUARDED_BY(_mutex);
-  std::size_t _written GUARDED_BY(_mutex) = 0;  // of _waiting
+  platform::Charge _events GUARDED_BY(_mutex);   // kept: nobody need ever read them
+  platform::Charge _replies GUARDED_BY(_mutex);  // working: their calls are waited for
+  std::size_t _written GUARDED_BY(_mutex) = 0;   // of _waiting
 };
 
 // Shuts a socket down and closes it so that the peer can still read what was written to it.

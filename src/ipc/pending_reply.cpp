@@ -3,12 +3,19 @@
 
 #include <fmt/format.h>
 
+#include <new>
+
 #include "ipc/frame.h"
 
 namespace veltrad::ipc {
 
 PendingReply::~PendingReply() {
-  if (!_answered.load(std::memory_order_acquire)) fail(makeReportingError("The daemon gave no reply.", -1));
+  if (_answered.load(std::memory_order_acquire)) return;
+  try {
+    fail(makeReportingError("The daemon gave no reply.", -1));
+  } catch (const std::bad_alloc&) {
+    _out->requestEnd();
+  }
 }
 
 void PendingReply::answer(Dictionary results) {
@@ -23,7 +30,15 @@ void PendingReply::fail(const ReportingError& error) {
   send({{"error", dictionaryOfError(error)}});
 }
 
-void PendingReply::send(Dictionary body) {
+void PendingReply::send(Dictionary body) noexcept {
+  try {
+    sendFrame(std::move(body));
+  } catch (const std::bad_alloc&) {
+    _out->requestEnd();  // a client that waits for this reply must not wait for ever
+  }
+}
+
+void PendingReply::sendFrame(Dictionary body) {
   const std::string frame = makeFrame(FrameKind::reply, _callID, std::move(body));
   if (_out->sendReply(frame) != OutQueue::Sent::tooLarge) return;
   const ReportingError error =

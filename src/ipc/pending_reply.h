@@ -25,7 +25,8 @@ class PendingReply {
   void fail(const ReportingError& error);
 
  private:
-  void send(Dictionary body);
+  void send(Dictionary body) noexcept;
+  void sendFrame(Dictionary body);
 
   const std::shared_ptr<OutQueue> _out;
   const std::uint32_t _callID;

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <new>
 
 #include "ipc/dispatcher.h"
 #include "ipc/remote_object.h"
@@ -34,16 +35,16 @@ std::string refusalFrame(const std::string& description) {
 
 SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
                                    platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
-                                   platform::Counters& counters, ReadBudget& budget,
+                                   platform::Counters& counters,
                                    std::shared_ptr<platform::MemoryAccount> account)
-    : _out(std::make_shared<OutQueue>(std::move(socket), counters)),
+    : _out(std::make_shared<OutQueue>(std::move(socket), counters, account)),
       _peer(std::move(peer)),
       _description(describe(number, _peer)),
       _account(std::move(account)),
       _entitlements(entitlements),
       _lentFiles(lentFiles),
       _counters(counters),
-      _reader(budget) {}
+      _reader(_account) {}
 
 std::optional<Value> SocketConnection::valueForEntitlement(std::string_view name) {
   return _entitlements.valueForEntitlement(name, _peer);
@@ -120,6 +121,7 @@ bool SocketConnection::receive() {
     if (_out->endRequested() || overdue()) return false;
     switch (_reader.receive(_out->socket())) {
       case SocketReader::Got::bytes:
+        _lackingRoomSince.reset();
         return true;
       case SocketReader::Got::nothing:
         break;
@@ -128,10 +130,22 @@ bool SocketConnection::receive() {
         return true;
       case SocketReader::Got::badDescriptors:
         return violation("More descriptors came than a frame can carry.");
-      case SocketReader::Got::overBudget:
-        return violation("Too many bytes of unfinished frames wait in the daemon; try again later.");
+      case SocketReader::Got::noRoom:
+        if (!waitForRoom()) {
+          return violation("Too many bytes of unfinished frames wait in the daemon; try again later.");
+        }
     }
   }
+}
+
+// What is kept for the client's user besides frames ends by itself, so that it is worth a wait. False: no
+// more.
+bool SocketConnection::waitForRoom() {
+  const auto now = Clock::now();
+  if (!_lackingRoomSince) _lackingRoomSince = now;
+  if (_reader.hopeless() || now - *_lackingRoomSince > kLongestWaitForMemory) return false;
+  poll(0, 100);
+  return true;
 }
 
 // Until the client has taken enough of what waits for it, or somebody woke us. Frames that have come may be
@@ -142,12 +156,13 @@ void SocketConnection::waitForClientToRead() {
 
 // Until the client has sent something, or takes something that waits for it, or somebody woke us.
 void SocketConnection::waitForBytes() {
+  _reader.rest();
   poll(_out->flush() > 0 ? POLLIN | POLLOUT : POLLIN);
 }
 
-void SocketConnection::poll(short events) {
+void SocketConnection::poll(short events, int milliseconds) {
   pollfd watched[] = {{_out->socket(), events, 0}, {_out->wakeUp(), POLLIN, 0}};
-  if (::poll(watched, 2, -1) > 0 && watched[1].revents != 0) _out->drainWakeUp();
+  if (::poll(watched, 2, milliseconds) > 0 && watched[1].revents != 0) _out->drainWakeUp();
 }
 
 bool SocketConnection::runFrame(const Frame& frame) {
@@ -157,18 +172,32 @@ bool SocketConnection::runFrame(const Frame& frame) {
     if (!came) return violation("A frame announced a descriptor, and none came.");
     lent = std::move(*came);
   }
-  if (!_greeted) return greet(frame);
-  if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
+  try {
+    if (!_greeted) return greet(frame);
+    if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
+  } catch (const std::bad_alloc&) {
+    // The call's reply, where one is owed, has said that it ended without an answer.
+    _counters.count("call ended: the daemon has no memory left");
+  }
   return true;
 }
 
 // What came with the frame is lent for the call, whose reply follows a request to remove the file.
 std::optional<std::string> SocketConnection::runCall(const Frame& frame, platform::FileDescriptor lent) {
-  if (!lent.isOpen()) return dispatchCall(frame, *_session, _out);
+  if (!lent.isOpen()) return dispatch(frame);
   const auto loan = _lentFiles.lend(std::move(lent), [out = _out, callID = frame.header.callID] {
     if (callID != 0) sendRemoveUploadedFile(*out, callID);
   });
-  return dispatchCall(frame, *_session, _out, loan.token());
+  return dispatch(frame, loan.token());
+}
+
+std::optional<std::string> SocketConnection::dispatch(const Frame& frame, const std::string& extensionToken) {
+  const bool large = frame.header.kind == FrameKind::largeCall;
+  CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters,
+                    [this] { return overdue(); }};
+  auto refusal = dispatchCall(frame, *_session, _out, memory, extensionToken);
+  if (large) _reader.rest();  // its buffer is part of what the call was charged
+  return refusal;
 }
 
 bool SocketConnection::greet(const Frame& frame) {
@@ -178,7 +207,7 @@ bool SocketConnection::greet(const Frame& frame) {
   }
   const auto body = decodeFrameBody(frame);
   if (!body) return violation(fmt::format("The hello cannot be read: {}.", body.error()));
-  const Value* stated = body.value().asDictionary()->find("wire");
+  const Value* stated = body.value().find("wire");
   const auto wire = stated ? stated->toInt64() : std::nullopt;
   if (!wire) return violation("The hello cannot be read: \"wire\" must be a number.");
   if (*wire != kWireVersion) {

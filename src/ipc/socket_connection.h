@@ -19,14 +19,13 @@ namespace veltrad::ipc {
 
 // Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
 // the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
-// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, lent files, counters and
-// budget outlive it. A session and its connection hold each other until run() returns.
+// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, lent files and
+// counters outlive it. A session and its connection hold each other until run() returns.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
   SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
                    platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
-                   platform::Counters& counters, ReadBudget& budget,
-                   std::shared_ptr<platform::MemoryAccount> account);
+                   platform::Counters& counters, std::shared_ptr<platform::MemoryAccount> account);
 
   // False: the system had no wake-up descriptor for it.
   bool usable() const { return _out->usable(); }
@@ -61,11 +60,13 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   bool runFrames();
   bool runFrame(const Frame& frame);
   std::optional<std::string> runCall(const Frame& frame, platform::FileDescriptor lent);
+  std::optional<std::string> dispatch(const Frame& frame, const std::string& extensionToken = {});
   bool greet(const Frame& frame);
   bool receive();
+  bool waitForRoom();
   void waitForClientToRead();
   void waitForBytes();
-  void poll(short events);
+  void poll(short events, int milliseconds = -1);
   void interrupted(const std::string& why);
   bool violation(const std::string& description);
   void end();
@@ -89,6 +90,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   bool _resumed = false;
   bool _greeted = false;
   bool _ended = false;  // the client's bytes have ended
+  std::optional<std::chrono::steady_clock::time_point> _lackingRoomSince;
 
   // Any thread.
   std::atomic<bool> _stopping{false};

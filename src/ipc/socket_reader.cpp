@@ -6,12 +6,15 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <tuple>
 
 namespace veltrad::ipc {
 
 namespace {
 
-constexpr std::size_t kLeastRoom = 4096;
+constexpr std::size_t kLeastRoom = kIdleReadBytes;
+// Of the bytes of a large call's body: the frame, its values, and what is made of them.
+constexpr std::size_t kLargeCallFactor = 3;
 constexpr std::size_t kMostRoom = 64u << 10;
 constexpr std::size_t kDescriptorsAtOnce = 4;
 // A client may send several frames with one descriptor each in a single message.
@@ -34,11 +37,9 @@ bool takeControl(msghdr& message, std::deque<platform::FileDescriptor>& into) {
 }  // namespace
 
 SocketReader::Got SocketReader::receive(int socket) {
-  const auto [place, size] = _frames.room(std::max(_wanted, kLeastRoom));
-  if (_frames.size() != _held) {
-    if (!_budget.change(_held, _frames.size())) return Got::overBudget;
-    _held = _frames.size();
-  }
+  auto [place, size] = _frames.room(std::max(_wanted, kLeastRoom));
+  if (!place) std::tie(place, size) = _frames.room(1);
+  if (!place) return Got::noRoom;
   iovec bytes{place, size};
   alignas(cmsghdr) char control[CMSG_SPACE(kDescriptorsAtOnce * sizeof(int))];
   msghdr message{};
@@ -63,6 +64,36 @@ SocketReader::Got SocketReader::receive(int socket) {
   _moreLikely = came == size || message.msg_controllen > 0;
   _wanted = came == size ? kMostRoom : kLeastRoom;
   return Got::bytes;
+}
+
+bool SocketReader::bufferOf(std::size_t bytes) {
+  if (!_account || _large.bytes() > 0) return true;
+  const std::size_t wanted = bytes > kIdleReadBytes ? bytes - kIdleReadBytes : 0;
+  if (wanted > _charge.bytes()) return chargeMore(wanted - _charge.bytes());
+  return _charge.resize(wanted);
+}
+
+bool SocketReader::chargeMore(std::size_t bytes) {
+  _lacking = bytes;
+  for (;;) {
+    if (auto more = _account->tryCharge(bytes, platform::MemoryUse::unfinished)) {
+      _charge.add(std::move(*more));
+      return true;
+    }
+    // What the user's batches hold makes room for what it sends now.
+    if (hopeless() || !_account->dropOldest()) return false;
+  }
+}
+
+bool SocketReader::hopeless() const {
+  return _account && _account->unfinishedFull(_lacking);
+}
+
+bool SocketReader::admitLargeCall(const FrameHeader& header) {
+  if (!_account) return true;
+  auto charge = _account->tryCharge(kLargeCallFactor * header.bodyLength, platform::MemoryUse::working);
+  if (charge) _large = std::move(*charge);
+  return charge.has_value();
 }
 
 std::optional<platform::FileDescriptor> SocketReader::takeDescriptor() {

@@ -1,29 +1,32 @@
-// Bytes and descriptors from a socket. The connection's own thread.
+// Bytes and descriptors from a socket, and who pays for them. The connection's own thread.
 #pragma once
 
 #include <deque>
+#include <memory>
 #include <optional>
 
 #include "ipc/frame.h"
-#include "ipc/read_budget.h"
 #include "platform/file_descriptor.h"
+#include "platform/memory_budget.h"
 
 namespace veltrad::ipc {
 
 // Job: reads without blocking into a FrameReader and queues the descriptors that came along, in order of
-// arrival. Of descriptors that nobody asks for it keeps a few, no more.
-class SocketReader {
+// arrival. Of descriptors that nobody asks for it keeps a few, no more. The buffer is charged to the client's
+// user before it grows, as the bytes of an unfinished frame; log data as a whole call, when its header comes.
+class SocketReader : private FrameMemory {
  public:
   enum class Got {
     bytes,
     nothing,         // none for now
     end,             // the client has closed, or its socket failed
     badDescriptors,  // more than a frame can carry, or the system had no room for them
-    overBudget,      // the unfinished frames of all clients hold too much
+    noRoom,          // its user keeps too much just now; nothing was read
   };
 
-  explicit SocketReader(ReadBudget& budget) : _budget(budget) {}
-  ~SocketReader() { _budget.change(_held, 0); }
+  // A null account pays for everything.
+  explicit SocketReader(std::shared_ptr<platform::MemoryAccount> account)
+      : _account(std::move(account)), _frames(*this) {}
   SocketReader(const SocketReader&) = delete;
   SocketReader& operator=(const SocketReader&) = delete;
 
@@ -34,13 +37,26 @@ class SocketReader {
   bool strayDescriptors() const { return !_descriptors.empty() && _frames.empty(); }
   // The last receive() may have left bytes in the socket, so that another one is worth its price.
   bool moreLikely() const { return _moreLikely; }
+  // After noRoom: unfinished frames hold all that they may, so that waiting is of no use.
+  bool hopeless() const;
+  // What was charged for the large call that next() has just handed out. The buffer is part of it until
+  // rest().
+  platform::Charge takeLargeCharge() { return std::move(_large); }
+  // The buffer shrinks to what is in it.
+  void rest() { _frames.rest(); }
 
  private:
-  ReadBudget& _budget;
-  std::size_t _held = 0;  // what the budget knows of
+  bool bufferOf(std::size_t bytes) override;
+  bool admitLargeCall(const FrameHeader& header) override;
+  bool chargeMore(std::size_t bytes);
+
+  const std::shared_ptr<platform::MemoryAccount> _account;
+  platform::Charge _charge;  // the buffer's
+  platform::Charge _large;   // of a large call that is coming
   FrameReader _frames;
   std::deque<platform::FileDescriptor> _descriptors;
   std::size_t _wanted = 0;
+  std::size_t _lacking = 0;
   bool _moreLikely = true;
 };
 

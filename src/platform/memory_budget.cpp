@@ -18,6 +18,19 @@ bool takeFrom(std::atomic<std::size_t>& sum, std::size_t bytes, std::size_t boun
   return true;
 }
 
+// Of the five sums of take(), so many concern each use.
+std::size_t sumsOf(MemoryUse use) {
+  switch (use) {
+    case MemoryUse::working:
+      return 2;
+    case MemoryUse::kept:
+      return 4;
+    case MemoryUse::unfinished:
+      return 5;
+  }
+  return 5;
+}
+
 }  // namespace
 
 Charge::Charge(Charge&& other) noexcept
@@ -40,6 +53,14 @@ bool Charge::resize(std::size_t bytes) {
   return true;
 }
 
+void Charge::add(Charge other) {
+  if (!_account) {
+    *this = std::move(other);
+    return;
+  }
+  _bytes += std::exchange(other._bytes, 0);
+}
+
 void Charge::release() {
   if (_account && _bytes > 0) _account->giveBack(_bytes, _use);
   _bytes = 0;
@@ -48,20 +69,26 @@ void Charge::release() {
 
 bool MemoryAccount::take(std::size_t bytes, MemoryUse use) {
   const MemoryBounds& bounds = _totals->bounds;
-  if (!takeFrom(_used, bytes, bounds.user)) return false;
-  const bool fits = takeFrom(_totals->used, bytes, bounds.all);
-  if (fits && use == MemoryUse::working) return true;
-  if (fits && takeFrom(_kept, bytes, bounds.userKept)) {
-    if (takeFrom(_totals->kept, bytes, bounds.allKept)) return true;
-    _kept.fetch_sub(bytes);
+  const struct {
+    std::atomic<std::size_t>& sum;
+    std::size_t bound;
+  } sums[] = {{_used, bounds.user},
+              {_totals->used, bounds.all},
+              {_kept, bounds.userKept},
+              {_totals->kept, bounds.allKept},
+              {_unfinished, bounds.userUnfinished}};
+  const std::size_t count = sumsOf(use);
+  for (std::size_t i = 0; i < count; ++i) {
+    if (takeFrom(sums[i].sum, bytes, sums[i].bound)) continue;
+    while (i > 0) sums[--i].sum.fetch_sub(bytes);
+    return false;
   }
-  if (fits) _totals->used.fetch_sub(bytes);
-  _used.fetch_sub(bytes);
-  return false;
+  return true;
 }
 
 void MemoryAccount::giveBack(std::size_t bytes, MemoryUse use) {
-  if (use == MemoryUse::kept) {
+  if (use == MemoryUse::unfinished) _unfinished.fetch_sub(bytes);
+  if (use != MemoryUse::working) {
     _totals->kept.fetch_sub(bytes);
     _kept.fetch_sub(bytes);
   }
@@ -73,17 +100,28 @@ void MemoryAccount::giveBack(std::size_t bytes, MemoryUse use) {
   _totals->changed.notifyAll();
 }
 
+bool MemoryAccount::unfinishedFull(std::size_t bytes) const {
+  const std::size_t bound = _totals->bounds.userUnfinished;
+  return bytes > bound || _unfinished.load() > bound - bytes;
+}
+
 std::optional<Charge> MemoryAccount::tryCharge(std::size_t bytes, MemoryUse use) {
   if (!take(bytes, use)) return std::nullopt;
   return Charge(shared_from_this(), bytes, use);
 }
 
 std::optional<Charge> MemoryAccount::keep(std::size_t bytes) {
-  if (bytes > _totals->bounds.userKept) return std::nullopt;
-  while (!take(bytes, MemoryUse::kept)) {
-    if (!dropOldest()) return std::nullopt;
+  Charge charge(shared_from_this(), 0, MemoryUse::kept);
+  if (!keepMore(charge, bytes)) return std::nullopt;
+  return charge;
+}
+
+bool MemoryAccount::keepMore(Charge& charge, std::size_t bytes) {
+  if (charge._bytes + bytes > _totals->bounds.userKept) return false;
+  while (!charge.resize(charge._bytes + bytes)) {
+    if (!dropOldest()) return false;
   }
-  return Charge(shared_from_this(), bytes, MemoryUse::kept);
+  return true;
 }
 
 std::optional<Charge> MemoryAccount::waitToCharge(std::size_t bytes, const std::function<bool()>& giveUp) {

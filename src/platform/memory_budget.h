@@ -17,15 +17,17 @@ namespace veltrad::platform {
 class MemoryAccount;
 
 struct MemoryBounds {
-  std::size_t user = 56u << 20;      // of one user id, in all
-  std::size_t userKept = 40u << 20;  // of these, what outlives the call that made it
-  std::size_t all = 256u << 20;      // of all user ids together
+  std::size_t user = 56u << 20;            // of one user id, in all
+  std::size_t userKept = 40u << 20;        // of these, what outlives the call that made it
+  std::size_t userUnfinished = 24u << 20;  // of these again, frames that have not come whole
+  std::size_t all = 256u << 20;            // of all user ids together
   std::size_t allKept = 192u << 20;
 };
 
 enum class MemoryUse {
-  working,  // ends by itself: a call that runs, an upload
-  kept,     // outlives its call: batches, posts, copies that wait, lingering dashboards
+  working,     // ends by itself: a call that runs, an upload
+  kept,        // outlives its call: batches, posts, copies that wait, lingering dashboards
+  unfinished,  // kept, too: the bytes of a frame that its client may never finish
 };
 
 // Bytes of an account, paid back by the object that frees the memory. An empty one holds nothing.
@@ -40,6 +42,8 @@ class Charge {
   // False: there is no room for more, and nothing has changed. Less is always possible. Of an empty charge:
   // false unless `bytes` is 0.
   [[nodiscard]] bool resize(std::size_t bytes);
+  // Takes over the other's bytes, which are of the same account and use.
+  void add(Charge other);
   void release();
 
  private:
@@ -71,7 +75,7 @@ class MemoryTotals {
   std::atomic<std::size_t> used{0};
   std::atomic<std::size_t> kept{0};
   std::atomic<std::size_t> waiting{0};  // threads in waitToCharge()
-  Mutex mutex LEAF_LOCK{LockRank::leaf};
+  Mutex mutex LEAF_LOCK{LockRank::memory};
   Condition changed;
 };
 
@@ -82,11 +86,15 @@ class MemoryAccount : public std::enable_shared_from_this<MemoryAccount> {
 
   unsigned uid() const { return _uid; }
   std::size_t used() const { return _used.load(std::memory_order_relaxed); }
+  // True when unfinished frames alone leave no room for so many bytes more: no use to wait for it.
+  bool unfinishedFull(std::size_t bytes) const;
 
   // Nothing: no room.
   std::optional<Charge> tryCharge(std::size_t bytes, MemoryUse use);
   // Kept bytes, for which the user's oldest evictable parts make room where they can. Nothing: no room.
   std::optional<Charge> keep(std::size_t bytes);
+  // The same for a charge that grows; false: no room, and nothing has changed but what made room.
+  bool keepMore(Charge& charge, std::size_t bytes);
   // Of the account's evictables the oldest part goes. False: there is none.
   bool dropOldest();
   // Working bytes; waits until there is room, as long as `giveUp` (asked every tenth of a second) is false.
@@ -105,6 +113,7 @@ class MemoryAccount : public std::enable_shared_from_this<MemoryAccount> {
   const std::shared_ptr<MemoryTotals> _totals;
   std::atomic<std::size_t> _used{0};
   std::atomic<std::size_t> _kept{0};
+  std::atomic<std::size_t> _unfinished{0};
   std::atomic<std::uint64_t> _turn{0};
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};

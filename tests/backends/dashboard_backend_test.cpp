@@ -62,7 +62,7 @@ class Dashboard : public ::testing::Test {
 };
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
-  LogDataUploads uploads(world.http);
+  LogDataUploads uploads(world.http, world.counters);
   const auto direct =
       DashboardBackend::initWithName(world.services, uploads, "direct", "127.0.0.1"s, server.port, "Desktop");
   const std::pair<std::shared_ptr<VeltraBackend>, char> cases[] = {

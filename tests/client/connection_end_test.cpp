@@ -77,8 +77,8 @@ TEST(ConnectionEnd, EndsEveryCallOnceWhenTheDaemonGoes) {
 }
 
 TEST(ConnectionEnd, AFrameOfImpossibleLengthOrALateRefusalEndsIt) {
-  for (const std::string& bytes : {rawFrame(FrameKind::reply, "", ipc::kFrameBodyLimit + 1),
-                                   ipc::makeFrame(FrameKind::refusal, 0, {})}) {
+  for (const std::string& bytes :
+       {rawFrame(FrameKind::reply, "", kFrameBodyLimit + 1), ipc::makeFrame(FrameKind::refusal, 0, {})}) {
     FakeDaemon daemon([&](WireEnd& link, const Received& call) {
       if (call.callID != 0) link.send(bytes);
     });

@@ -63,7 +63,8 @@ using Seen = std::tuple<std::vector<std::string>, bool, std::size_t>;
 
 Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
   static platform::Counters counters;
-  static const auto out = std::make_shared<ipc::OutQueue>(platform::FileDescriptor(), counters);
+  static const auto out = std::make_shared<ipc::OutQueue>(platform::FileDescriptor(), counters, nullptr);
+  static const auto account = platform::MemoryBudget().accountOf(0);
   AnsweringSession session;
   ipc::FrameReader reader;
   std::vector<std::string> bodies;
@@ -77,7 +78,8 @@ Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
     size -= count;
     for (ipc::Frame frame; (next = reader.next(frame)) == ipc::FrameReader::Next::frame;) {
       bodies.emplace_back(frame.body);
-      if (!ipc::dispatchCall(frame, session, out)) ++readable;
+      ipc::CallMemory memory{account, {}, counters, [] { return true; }};
+      if (!ipc::dispatchCall(frame, session, out, memory)) ++readable;
     }
   }
   if (session.calls != readable) std::abort();  // a call is run exactly when it is readable

@@ -44,8 +44,8 @@ TEST(Connection, EndsWhenTheClientBreaksTheProtocolAndSaysHow) {
       {helloFrame("1"), "\"wire\" must be a number"},
       {rawFrame(FrameKind::hello, ""), "The hello cannot be read"},
       {"GET / HTTP/1.1\r\n\r\n", "A frame of 1195725856 bytes"},
-      {hello + rawFrame(FrameKind::call, "", ipc::kFrameBodyLimit + 1), "at most 1048576"},
-      {hello + rawFrame(FrameKind::largeCall, "", ipc::kLargeFrameBodyLimit + 1), "at most 67108864"},
+      {hello + rawFrame(FrameKind::call, "", kFrameBodyLimit + 1), "at most 1048576"},
+      {hello + rawFrame(FrameKind::largeCall, "", kLargeFrameBodyLimit + 1), "at most 16777216"},
       {hello + rawFrame(FrameKind::call, "", 4, 2), "with 2 descriptors"},
       {hello + rawFrame(FrameKind::call, "body", {}, 1), "A frame announced a descriptor, and none came."},
   };
@@ -175,11 +175,13 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
 }
 
 TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
-  Door door(4096, 1024, 1u << 20);
-  const std::string most =
-      callFrame(1, kUploadLogData, {{"data", Array{std::string(900'000, 'x')}}}, FrameKind::largeCall);
+  platform::MemoryBounds bounds;
+  bounds.userUnfinished = 2u << 20;
+  Door door(4096, 1024, bounds);
+  const std::string most = callFrame(
+      1, kSend, {{"category", 1}, {"type", 1}, {"payload", Dictionary{{"x", std::string(900'000, 'x')}}}});
   WireEnd boasting = door.client();  // what a header declares holds nothing
-  boasting.send(rawFrame(FrameKind::largeCall, "", ipc::kLargeFrameBodyLimit));
+  boasting.send(rawFrame(FrameKind::largeCall, "", kLargeFrameBodyLimit));
   boasting.waitUntilRead();
   boasting.send("x");
   boasting.waitUntilRead();

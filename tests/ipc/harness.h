@@ -71,13 +71,13 @@ inline std::string helloFrame(Value wire = 1) {
 // A door in a directory of its own that lets everybody in.
 class Door : public ListenerDelegate {
  public:
-  explicit Door(std::size_t most = 4096, std::size_t mostOfOneUser = 1024,
-                std::size_t readBudget = ipc::kReadBudget) {
+  explicit Door(std::size_t most = 4096, std::size_t mostOfOneUser = 1024, platform::MemoryBounds bounds = {})
+      : memory(bounds) {
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
     _listener = std::make_unique<Listener>(
         ipc::ListenerOptions{std::move(socket.value()), _entitlements, lentFiles, counters, memory,
-                             root.entitlementsPath(), most, mostOfOneUser, readBudget},
+                             root.entitlementsPath(), most, mostOfOneUser},
         *this);
     EXPECT_TRUE(_listener->resume());
   }

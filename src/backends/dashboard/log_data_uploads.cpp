@@ -5,12 +5,16 @@
 
 #include "base/property_list.h"
 #include "base/text.h"
+#include "platform/counters.h"
 #include "platform/http_client.h"
 #include "platform/log.h"
 
 namespace veltrad {
 
 namespace {
+// A place is a short text; what is longer is none.
+constexpr std::size_t kMostAnswerBytes = 1u << 20;
+
 // Nothing: memory for it is short.
 std::optional<std::string> archiveOf(const Array& logData) {
   try {
@@ -25,49 +29,40 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
                                                   const Array& logData) {
   if (!postURL) {
     logError("DashboardBackend(uploadLogData): Post URL for log data array is nil");
+    _counters.count("log data lost: no address to post it to");
     return std::nullopt;
   }
   auto archive = archiveOf(logData);
   if (!archive) {
     logError("DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
+    _counters.count("log data lost: no memory for its archive");
     return std::nullopt;
   }
   const auto body = post(*postURL, std::move(*archive));
   if (!body.ok() || body.value().empty()) {
     logError("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
              body.ok() ? "" : body.error().c_str());
+    _counters.count(body.ok() ? "log data lost: the server named no place"
+                              : "log data lost: the post failed");
     return std::nullopt;
   }
+  _counters.count("log data uploaded");
   std::string location = toUTF8(body.value());
   logDebug("DashboardBackend(uploadLogData): Log data uploaded to %s", location.c_str());
   return location;
 }
 
 Result<std::string, std::string> LogDataUploads::post(const std::string& url, std::string archive) {
-  const std::size_t bytes = archive.size();
-  if (!reserve(bytes)) return Failure<std::string>{"Too many log data uploads under way"};
   platform::HTTPRequest request;
   request.method = platform::HTTPRequest::Method::post;
-  request.lane = platform::HTTPRequest::Lane::upload;
+  request.lane = platform::HTTPRequest::Lane::logData;
   request.url = url;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body = std::move(archive);
+  request.mostResponseBytes = kMostAnswerBytes;
   platform::HTTPResult result = _http.perform(std::move(request));
-  release(bytes);
   if (!result.ok()) return Failure{result.error().description};
   return std::move(result.value().body);
-}
-
-bool LogDataUploads::reserve(std::size_t bytes) {
-  const Lock held(_mutex);
-  if (_bytesUnderWay > 0 && _bytesUnderWay + bytes > kMostBytes) return false;
-  _bytesUnderWay += bytes;
-  return true;
-}
-
-void LogDataUploads::release(std::size_t bytes) {
-  const Lock held(_mutex);
-  _bytesUnderWay -= bytes;
 }
 
 }  // namespace veltrad
