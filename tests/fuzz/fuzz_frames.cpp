@@ -78,8 +78,10 @@ Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
     size -= count;
     for (ipc::Frame frame; (next = reader.next(frame)) == ipc::FrameReader::Next::frame;) {
       bodies.emplace_back(frame.body);
-      ipc::CallMemory memory{account, {}, counters, [] { return true; }};
-      if (!ipc::dispatchCall(frame, session, out, memory)) ++readable;
+      ipc::CallMemory memory{account,
+                             *account->tryCharge(3 * frame.body.size(), platform::MemoryUse::working),
+                             counters, [] { return true; }};
+      if (!ipc::dispatchCall(frame, session, out, memory) && !memory.usedUp) ++readable;
     }
   }
   if (session.calls != readable) std::abort();  // a call is run exactly when it is readable
