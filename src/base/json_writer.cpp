@@ -104,4 +104,26 @@ std::string writeJSON(const Value& value, JSONStyle style) {
   return out;
 }
 
+namespace {
+// With its quotes. A control character may become six characters, a byte that is no UTF-8 three.
+std::size_t textBytesAtMost(std::string_view text) {
+  std::size_t more = 0;
+  for (const char c : text) {
+    const auto byte = static_cast<unsigned char>(c);
+    more += (byte < 0x20 ? 5u : 0u) + (byte >= 0x7f ? 2u : 0u) + (c == '"' || c == '\\' ? 1u : 0u);
+  }
+  return text.size() + more + 2;
+}
+}  // namespace
+
+std::size_t jsonBytesAtMost(const Dictionary& flat) {
+  constexpr std::size_t kNumber = 32, kPunctuation = 2;
+  std::size_t bytes = kPunctuation;
+  for (const auto& [key, value] : flat) {
+    const std::string* text = value.asString();
+    bytes += textBytesAtMost(key) + (text ? textBytesAtMost(*text) : kNumber) + kPunctuation;
+  }
+  return bytes;
+}
+
 }  // namespace veltrad

@@ -9,6 +9,7 @@
 
 #include "base/mutex.h"
 #include "base/text.h"
+#include "base/value.h"
 #include "platform/http_inbox.h"
 #include "platform/http_worker.h"
 #include "platform/log.h"
@@ -44,6 +45,16 @@ std::optional<std::string_view> HTTPResponse::header(std::string_view name) cons
     if (equalIgnoringCase(key, name)) return value;
   }
   return std::nullopt;
+}
+
+std::size_t keptBytes(const HTTPRequest& request) {
+  // The transfer, its place in the queues, and the two copies of each header.
+  constexpr std::size_t kTransfer = 1536, kCopies = 2, kHeader = 96;
+  std::size_t bytes = kTransfer + 2 * request.url.capacity() + blockBytes(request.body.capacity());
+  for (const auto& [name, value] : request.headers) {
+    bytes += kHeader + kCopies * (name.capacity() + value.capacity());
+  }
+  return bytes;
 }
 
 struct CurlHTTPClient::Impl {

@@ -74,6 +74,10 @@ struct HTTPError {
   int status = 0;           // of an answer that then was cut; 0: none came
 };
 
+// What the request keeps until its completion has run, what libcurl copies of it included; not what the
+// completion itself keeps.
+std::size_t keptBytes(const HTTPRequest& request);
+
 using HTTPResult = Result<HTTPResponse, HTTPError>;
 using HTTPCompletion = std::function<void(HTTPResult)>;
 

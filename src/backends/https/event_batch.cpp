@@ -1,54 +1,74 @@
 // The batch's counts and bounds.
 #include "backends/https/event_batch.h"
 
+#include "base/json.h"
+
 namespace veltrad {
+
+EventSize sizeOfEvent(const Dictionary& event) {
+  // While a flush runs there are the compact text, the readable one and the compressed body.
+  constexpr std::size_t kTexts = 3;
+  const std::size_t json = jsonBytesAtMost(event);
+  return {json, sizeof(Dictionary) + keptBytes(event) + kTexts * json};
+}
+
+std::optional<std::uint64_t> EventBatch::oldestTurn() const {
+  if (_events.empty()) return std::nullopt;
+  return _events.front().turn;
+}
 
 bool EventBatch::thresholdReached(std::int32_t method, std::int32_t threshold) const {
   const auto at = _counts.find(method);
   return (at == _counts.end() ? 0 : at->second) > threshold;
 }
 
-std::size_t EventBatch::roughBytes(const Dictionary& event) {
-  std::size_t bytes = 0;
-  for (const auto& [key, value] : event) {
-    bytes += key.size() + 16;
-    if (const std::string* text = value.asString()) bytes += text->size();
-  }
-  return bytes;
+bool EventBatch::full(const EventSize& event) const {
+  return _events.size() >= kMostEvents || _bytes.json + event.json > kMostBytes;
 }
 
-bool EventBatch::full(const Dictionary& event) const {
-  return _events.size() >= kMostEvents || _bytes + roughBytes(event) > kMostBytes;
-}
-
-void EventBatch::add(std::int32_t method, Dictionary event) {
-  _exists = true;
-  _bytes += roughBytes(event);
-  _events.push_back(std::move(event));
+void EventBatch::add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn) {
+  account(size);
+  _events.push_back({std::move(event), size, turn});
   ++_counts[method];
 }
 
 void EventBatch::dropOldest() {
   if (_events.empty()) return;
-  _bytes -= roughBytes(_events.front());
-  _events.erase(_events.begin());
+  unaccount(_events.front().size);
+  _events.pop_front();
 }
 
 void EventBatch::setSessionID(const std::string& sessionID) {
-  for (Dictionary& event : _events) event.set("_sessionID", sessionID);
+  for (Event& event : _events) {
+    unaccount(event.size);
+    event.fields.set("_sessionID", sessionID);
+    event.size = sizeOfEvent(event.fields);
+    account(event.size);
+  }
 }
 
 std::vector<Dictionary> EventBatch::take() {
   _counts.clear();
-  std::vector<Dictionary> taken = std::move(_events);
+  std::vector<Dictionary> taken;
+  taken.reserve(_events.size());
+  for (Event& event : _events) taken.push_back(std::move(event.fields));
   discard();
   return taken;
 }
 
 void EventBatch::discard() {
-  _exists = false;
-  _events.clear();
-  _bytes = 0;
+  std::deque<Event>().swap(_events);
+  _bytes = {};
+}
+
+void EventBatch::account(const EventSize& size) {
+  _bytes.json += size.json;
+  _bytes.charged += size.charged;
+}
+
+void EventBatch::unaccount(const EventSize& size) {
+  _bytes.json -= size.json;
+  _bytes.charged -= size.charged;
 }
 
 }  // namespace veltrad

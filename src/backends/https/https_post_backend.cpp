@@ -38,13 +38,6 @@ bool meansSamplingOverride(std::int32_t flag) {
 }
 }  // namespace
 
-HTTPSPostBackend::~HTTPSPostBackend() {
-  const Lock held(_batchMutex);
-  if (_batch.size() > 0) {
-    _services.counters.count("event dropped: its back end ended before a flush", _batch.size());
-  }
-}
-
 std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* payload,
                                                          platform::TimeValue timestamp, std::uint16_t method,
                                                          std::uint16_t respCode, std::uint16_t eventID,
@@ -65,6 +58,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* paylo
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
+  const std::uint64_t sessionIDChanges = _held->sessionIDChanges();  // before the event is built
   Dictionary event = createEventDictfromPayload(*this, payload, timestamp, method, respCode, eventID,
                                                 _services.locale.timeZoneOffset());
   prepareEventForMessage(event);
@@ -76,7 +70,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* paylo
   const bool userInfoMissing = requireUserInfo() && !userInfoDict();
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batchEvents()) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batchEvents(), requireUserInfo());
-    return batchEvent(std::move(event));
+    return batchEvent(std::move(event), sessionIDChanges);
   }
   return postEvent(std::move(event), realtime, method, respCode, flag);
 }
@@ -84,12 +78,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* paylo
 std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, bool realtime, std::uint16_t method,
                                                        std::uint16_t respCode, std::int32_t flag) {
   std::optional<std::string> flushed;
-  bool batchExists = false;
-  {
-    const Lock held(_batchMutex);
-    batchExists = _batch.exists();
-  }
-  if (realtime && batchExists) {
+  if (realtime && !_held->empty()) {
     logDebug(
         "HTTPSPostBackend(sendMessage): Got a realtime event and some events have already been batched. "
         "Forcing Flush "
@@ -97,6 +86,15 @@ std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, bool re
     flushed = flushMessagesWithCompletion(nullptr);
   }
   logDebug("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), batchEvents(), requireUserInfo());
+  restrict(event);
+  std::optional<platform::Charge> charge{std::in_place};
+  if (memoryAccount()) {
+    charge = memoryAccount()->tryCharge(sizeOfEvent(event).charged, platform::MemoryUse::kept);
+  }
+  if (!charge) {
+    refusePost(1, nullptr);
+    return flushed;
+  }
   std::vector<Dictionary> events;
   events.push_back(std::move(event));
   std::optional<std::string> pretty;
@@ -105,7 +103,7 @@ std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, bool re
   if (flushed) {
     result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + (pretty ? *pretty : "(null)");
   }
-  postJSONMessage(std::move(json), flag, EventMap{method, respCode}, 1, nullptr);
+  postJSONMessage(std::move(json), flag, EventMap{method, respCode}, 1, std::move(*charge), 0, nullptr);
   return result;
 }
 
@@ -132,56 +130,45 @@ void HTTPSPostBackend::filterEvent(Dictionary& event) const {
   if (outcome.hashed > 0) _services.counters.count("event field hashed: by a filter", outcome.hashed);
 }
 
-std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event) {
+std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::uint64_t sessionIDChanges) {
   // The event's own: user info and filters may have changed it.
   const std::int32_t method = event.int32("_method").value_or(0);
+  // What no event may carry need not be kept until a flush takes it out.
+  restrict(event);
   std::optional<std::string> flushed;
-  bool reached = false;
-  bool full = false;
-  {
-    const Lock held(_batchMutex);
-    reached = _batch.thresholdReached(method, _eventThreshold);
-    full = _batch.full(event);
-  }
-  if (reached) {
+  const HeldEvents::Need need = _held->needOf(method, _eventThreshold, sizeOfEvent(event));
+  if (need == HeldEvents::Need::flush) {
     logDebug(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
         "%d",
         method);
     flushed = flushMessagesWithCompletion(nullptr);
-  } else if (full && state() == kBackendReporting) {
+    _held->restartCount(method);
+  } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  std::size_t dropped = 0;
-  {
-    const Lock held(_batchMutex);
-    if (reached) _batch.restartCount(method);
-    while (_batch.size() > 0 && _batch.full(event)) {
-      _batch.dropOldest();
-      ++dropped;
-    }
-    _batch.add(method, std::move(event));
-  }
-  if (dropped > 0) _services.counters.count("event dropped: the batch is full", dropped);
-  _services.counters.count("event held: batched");
+  const bool kept = keep(std::move(event), method, sessionIDChanges);
+  _services.counters.count(kept ? "event held: batched" : "event dropped: its user keeps too much");
   return flushed;
 }
 
+// False: there is no room for it, even without what the user's other batches hold.
+bool HTTPSPostBackend::keep(Dictionary event, std::int32_t method, std::uint64_t sessionIDChanges) {
+  const EventSize size = sizeOfEvent(event);
+  platform::MemoryAccount* account = memoryAccount().get();
+  auto charge = account ? account->keep(size.charged) : platform::Charge();
+  if (!charge) return false;
+  if (account && !std::exchange(_evictable, true)) account->add(_held);
+  _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
+             sessionIDChanges);
+  return true;
+}
+
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
-  bool exists = false;
-  std::size_t discarded = 0;
-  {
-    const Lock held(_batchMutex);
-    exists = _batch.exists();
-    if (exists && state() != kBackendReporting) {
-      discarded = _batch.size();
-      _batch.discard();
-      exists = false;
-    }
+  if (state() != kBackendReporting) {
+    _services.counters.count("event dropped: flushed while the back end does not report", _held->discard());
   }
-  if (discarded > 0)
-    _services.counters.count("event dropped: flushed while the back end does not report", discarded);
-  if (!exists) {
+  if (_held->empty()) {
     if (completion) completion(std::nullopt, makeReportingError("Nothing to flush", -1));
     return std::nullopt;
   }
@@ -191,42 +178,47 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     return std::nullopt;
   }
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
-  std::vector<Dictionary> events;
-  {
-    const Lock held(_batchMutex);
-    events = _batch.take();
-  }
+  HeldEvents::Taken taken = _held->take();
+  const std::size_t count = taken.events.size();
   if (userInfo) {
     Dictionary filtered = *userInfo;
     filterEvent(filtered);
-    for (Dictionary& event : events) event.merge(filtered);
+    const std::size_t more = count * sizeOfEvent(filtered).charged;
+    if (memoryAccount() && !memoryAccount()->keepMore(taken.charge, more)) {
+      refusePost(count, completion);
+      return std::nullopt;
+    }
+    for (Dictionary& event : taken.events) event.merge(filtered);
   }
-  const std::size_t count = events.size();
   std::optional<std::string> pretty;
-  std::string json = createMessageForPostAndLogging(std::move(events), pretty);
+  std::string json = createMessageForPostAndLogging(std::move(taken.events), pretty);
   FlushCompletion whenPosted;
+  std::size_t completionBytes = 0;
   if (completion) {
+    completionBytes = pretty ? pretty->size() : 0;
     whenPosted = [completion = std::move(completion), pretty](const std::optional<std::string>&,
                                                               std::optional<ReportingError> error) {
       completion(pretty, std::move(error));
     };
   }
-  postJSONMessage(std::move(json), 0, std::nullopt, count, std::move(whenPosted));
+  postJSONMessage(std::move(json), 0, std::nullopt, count, std::move(taken.charge), completionBytes,
+                  std::move(whenPosted));
   return pretty;
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {
   setCombinedSessionIDString(sessionID);
-  const Lock held(_batchMutex);
-  _batch.setSessionID(sessionID);
+  _held->setSessionID(sessionID);
+}
+
+void HTTPSPostBackend::restrict(Dictionary& event) const {
+  _services.counters.count("event field removed: JSON cannot carry it", restrictEventForJSON(event));
 }
 
 std::string HTTPSPostBackend::createMessageForPostAndLogging(std::vector<Dictionary> events,
                                                              std::optional<std::string>& pretty) {
   const double postTime = platform::timevalToSeconds(_services.clock.now());
-  std::size_t removed = 0;
-  for (Dictionary& event : events) removed += restrictEventForJSON(event);
-  if (removed > 0) _services.counters.count("event field removed: JSON cannot carry it", removed);
+  for (Dictionary& event : events) restrict(event);
   JSONMessage message = makeJSONMessage(postTime, clientIdentifier(), std::move(events), loggingAllowed());
   pretty = std::move(message.pretty);
   return std::move(message.compact);
@@ -247,6 +239,7 @@ bool HTTPSPostBackend::loggingAllowed() const {
 
 void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
                                        std::optional<EventMap> eventMap, std::size_t eventCount,
+                                       platform::Charge charge, std::size_t completionBytes,
                                        FlushCompletion completion) {
   const auto& url = meansRealtime(withFlag) ? _realtimePostURL : _postURL;
   if (!url) {
@@ -256,6 +249,10 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
   }
   platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
   request.sequence = reinterpret_cast<std::uintptr_t>(this);
+  request.charge = std::move(charge);
+  if (memoryAccount() && !request.charge.resize(platform::keptBytes(request) + completionBytes)) {
+    return refusePost(eventCount, completion);
+  }
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
   const auto answered = [self, postedTo = *url, eventCount,
                          completion = std::move(completion)](const platform::HTTPResult& result) {
@@ -264,6 +261,12 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
   };
   if (auto refusal = _services.http.start(std::move(request), answered))
     answered(Failure{std::move(*refusal)});
+}
+
+void HTTPSPostBackend::refusePost(std::size_t eventCount, const FlushCompletion& completion) {
+  const platform::HTTPError refusal{platform::HTTPError::Kind::tooMany, "Too many posts under way"};
+  auto error = handleAnswer(Failure{refusal}, {}, eventCount);
+  if (completion) completion(std::nullopt, std::move(error));
 }
 
 std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result,

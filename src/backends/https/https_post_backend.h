@@ -9,8 +9,8 @@
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
 #include "backends/https/client_decision.h"
-#include "backends/https/event_batch.h"
 #include "backends/https/filter_table.h"
+#include "backends/https/held_events.h"
 #include "backends/https/post_request.h"
 
 namespace veltrad {
@@ -21,9 +21,6 @@ class HTTPSPostBackend final : public VeltraBackend {
   static std::shared_ptr<HTTPSPostBackend> initWithName(const BackendServices& services,
                                                         const std::string& name, const Dictionary* profile,
                                                         const std::optional<std::string>& productFamily);
-
-  // Counts the events that were still batched: a second start, or user info that never came, lets them go.
-  ~HTTPSPostBackend() override;
 
   void updateState() override;
   using VeltraBackend::sendMessage;
@@ -55,7 +52,9 @@ class HTTPSPostBackend final : public VeltraBackend {
   Dictionary withStopFields(const Dictionary* payload) const;
   void prepareEventForMessage(Dictionary& event) const;
   void filterEvent(Dictionary& event) const;
-  std::optional<std::string> batchEvent(Dictionary event);
+  void restrict(Dictionary& event) const;
+  std::optional<std::string> batchEvent(Dictionary event, std::uint64_t sessionIDChanges);
+  bool keep(Dictionary event, std::int32_t method, std::uint64_t sessionIDChanges);
   std::optional<std::string> postEvent(Dictionary event, bool realtime, std::uint16_t method,
                                        std::uint16_t respCode, std::int32_t flag);
   // The compact JSON; `pretty` gets the readable copy where logging is allowed.
@@ -63,8 +62,12 @@ class HTTPSPostBackend final : public VeltraBackend {
                                              std::optional<std::string>& pretty);
   const std::string& clientIdentifier() const;
   bool loggingAllowed() const;
+  // Nothing is kept for what is not posted: such events are lost, counted, and `completion` is told.
+  void refusePost(std::size_t eventCount, const FlushCompletion& completion);
+  // `charge` pays for the post and, with `completionBytes`, for what its completion keeps.
   void postJSONMessage(std::string json, std::int32_t withFlag, std::optional<EventMap> eventMap,
-                       std::size_t eventCount, FlushCompletion completion);
+                       std::size_t eventCount, platform::Charge charge, std::size_t completionBytes,
+                       FlushCompletion completion);
   // HTTP thread. Nothing: the post ended without an error.
   std::optional<ReportingError> handleAnswer(const platform::HTTPResult& result, const std::string& url,
                                              std::size_t eventCount);
@@ -87,9 +90,9 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::optional<double> _overrideSampling;
   std::optional<std::string> _uuidCustom;
   FilterTable _filters;
+  bool _evictable = false;  // the user's account knows the batch
 
-  Mutex _batchMutex BACKEND_LOCK{LockRank::backend};
-  EventBatch _batch GUARDED_BY(_batchMutex);
+  const std::shared_ptr<HeldEvents> _held;
 };
 
 // "forceEventLogging": true when the text, after blanks, a sign and zeros, begins with Y, y, T, t or a digit

@@ -52,7 +52,8 @@ HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, const std::s
       _forceEventLogging(
           textMeansYes(services.preferences.text(platform::kVeltraPreferenceDomain, "forceEventLogging"))),
       _uuidRespectDnu(services.library.getPersistentIdentifierForDNU(true)),
-      _uuidOverrideDnu(services.library.getPersistentIdentifierForDNU(false)) {
+      _uuidOverrideDnu(services.library.getPersistentIdentifierForDNU(false)),
+      _held(std::make_shared<HeldEvents>(services.counters)) {
   _postURL = services.preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL");
   if (_postURL)
     logDebug("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());

@@ -1,0 +1,93 @@
+// The batch under its lock.
+#include "backends/https/held_events.h"
+
+#include "platform/counters.h"
+
+namespace veltrad {
+
+HeldEvents::~HeldEvents() {
+  const Lock held(_mutex);
+  _counters.count("event dropped: its back end ended before a flush", _batch.size());
+}
+
+bool HeldEvents::empty() const {
+  const Lock held(_mutex);
+  return _batch.size() == 0;
+}
+
+HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,
+                                    const EventSize& size) const {
+  const Lock held(_mutex);
+  if (_batch.thresholdReached(method, threshold)) return Need::flush;
+  return _batch.full(size) ? Need::bound : Need::room;
+}
+
+void HeldEvents::add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
+                     std::uint64_t turn, std::uint64_t sessionIDChanges) {
+  std::size_t dropped = 0;
+  {
+    const Lock held(_mutex);
+    for (; _batch.size() > 0 && _batch.full(size); ++dropped) _batch.dropOldest();
+    _charge.add(std::move(charge));
+    const bool changed = sessionIDChanges != _sessionIDChanges.load(std::memory_order_relaxed);
+    if (changed) event.set("_sessionID", _sessionID);
+    _batch.add(method, std::move(event), size, turn);
+    if (dropped > 0) settle();
+  }
+  _counters.count("event dropped: the batch is full", dropped);
+}
+
+void HeldEvents::restartCount(std::int32_t method) {
+  const Lock held(_mutex);
+  _batch.restartCount(method);
+}
+
+void HeldEvents::setSessionID(const std::string& sessionID) {
+  std::size_t dropped = 0;
+  {
+    const Lock held(_mutex);
+    _sessionID = sessionID;
+    _sessionIDChanges.fetch_add(1, std::memory_order_release);
+    _batch.setSessionID(sessionID);
+    dropped = settle();
+  }
+  _counters.count("event dropped: its user keeps too much", dropped);
+}
+
+HeldEvents::Taken HeldEvents::take() {
+  const Lock held(_mutex);
+  return {_batch.take(), std::move(_charge)};
+}
+
+std::size_t HeldEvents::discard() {
+  const Lock held(_mutex);
+  const std::size_t events = _batch.size();
+  _batch.discard();
+  _charge.release();
+  return events;
+}
+
+std::optional<std::uint64_t> HeldEvents::oldestTurn() const {
+  const Lock held(_mutex);
+  return _batch.oldestTurn();
+}
+
+void HeldEvents::dropOldest() {
+  {
+    const Lock held(_mutex);
+    if (_batch.size() == 0) return;
+    _batch.dropOldest();
+    settle();
+  }
+  _counters.count("event dropped: its user keeps too much");
+}
+
+// The charge follows the batch; how many events had to go because it could not grow.
+std::size_t HeldEvents::settle() {
+  if (_charge.bytes() == 0) return 0;  // nobody pays
+  std::size_t dropped = 0;
+  for (; !_charge.resize(_batch.chargedBytes()); ++dropped) _batch.dropOldest();
+  return dropped;
+}
+
+}  // namespace veltrad
