@@ -2,8 +2,7 @@
 #include "platform/http_client.h"
 
 #include <atomic>
-#include <cstdlib>
-#include <mutex>
+#include <new>
 #include <system_error>
 #include <thread>
 
@@ -12,7 +11,6 @@
 #include "base/value.h"
 #include "platform/http_inbox.h"
 #include "platform/http_worker.h"
-#include "platform/log.h"
 
 namespace veltrad::platform {
 
@@ -60,23 +58,38 @@ std::size_t keptBytes(const HTTPRequest& request) {
 struct CurlHTTPClient::Impl {
   explicit Impl(HTTPClientSettings given) : settings(std::move(given)) {}
 
-  // Nothing of libcurl is touched before the first request.
-  void file(HTTPRequest request, HTTPCompletion completion, bool blocking) {
-    std::call_once(once, [this] { startThread(); });
-    const auto now = std::chrono::steady_clock::now();
-    if (inbox.add(std::make_unique<CurlTransfer>(std::move(request), std::move(completion), blocking, now))) {
-      worker->wake();
+  // Nothing: it was taken.
+  std::optional<HTTPError> file(HTTPRequest request, HTTPCompletion completion, bool blocking) {
+    try {
+      if (auto error = startThread()) return error;
+      HTTPInbox::Transfers one;
+      one.push_back(std::make_unique<CurlTransfer>(std::move(request), std::move(completion), blocking,
+                                                   std::chrono::steady_clock::now()));
+      const HTTPInbox::Added added = inbox.add(one);
+      if (added == HTTPInbox::Added::refused)
+        return HTTPError{HTTPError::Kind::tooMany, "Too many posts under way"};
+      if (added == HTTPInbox::Added::first) worker->wake();
+      return std::nullopt;
+    } catch (const std::bad_alloc&) {
+      return CurlTransfer::outOfMemory();
     }
   }
-  void startThread() {
-    worker = std::make_unique<HTTPWorker>(inbox, settings.extraCertificatesPath);
+  // Nothing of libcurl is touched before the first request. What was short is not remembered.
+  std::optional<HTTPError> startThread() {
+    if (started.load(std::memory_order_acquire)) return std::nullopt;
+    const Lock lock(starting);
+    if (started.load(std::memory_order_relaxed)) return std::nullopt;
+    auto made = HTTPWorker::make(inbox, settings.extraCertificatesPath);
+    if (!made) return HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"};
     try {
-      thread = std::thread([this] { worker->run(); });
+      thread = std::thread([running = made.get()] { running->run(); });
     } catch (const std::system_error& error) {
-      logError("The HTTP thread cannot be started: %s", error.what());
-      std::abort();
+      return HTTPError{HTTPError::Kind::shortage,
+                       std::string("The HTTP thread cannot be started: ") + error.code().message().c_str()};
     }
+    worker = std::move(made);
     started.store(true, std::memory_order_release);
+    return std::nullopt;
   }
   // False when there is no thread yet.
   bool wake() {
@@ -87,7 +100,7 @@ struct CurlHTTPClient::Impl {
 
   const HTTPClientSettings settings;
   HTTPInbox inbox;
-  std::once_flag once;
+  Mutex starting LEAF_LOCK{LockRank::leaf};
   std::atomic<bool> started{false};
   std::unique_ptr<HTTPWorker> worker;  // both set once, before `started`
   std::thread thread;
@@ -102,16 +115,16 @@ CurlHTTPClient::~CurlHTTPClient() {
 }
 
 std::optional<HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
-  _impl->file(std::move(request), std::move(completion), false);
-  return std::nullopt;
+  return _impl->file(std::move(request), std::move(completion), false);
 }
 
 HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
   if (_impl->inbox.blockingFails()) return Failure{CurlTransfer::stopping()};
   const auto answer =
       std::make_shared<Answer>();  // the giver may still be at its lock when the waiter has gone
-  _impl->file(
+  auto refusal = _impl->file(
       std::move(request), [answer](HTTPResult result) { answer->give(std::move(result)); }, true);
+  if (refusal) return Failure{std::move(*refusal)};
   return answer->wait();
 }
 

@@ -28,7 +28,7 @@ struct FileBody {
 struct HTTPRequest {
   enum class Method { get, post };
   // What bounds apply. Storebag requests are always admitted; at most 1,024 event posts are under way; three
-  // file uploads run at a time and three of log data, others wait.
+  // file uploads run at a time and three of log data, others wait, and their time has not begun.
   enum class Lane { storebag, event, upload, logData };
 
   Method method = Method::get;
@@ -46,16 +46,17 @@ struct HTTPRequest {
   // Posts of one sequence to one host begin in order: each when the one before it has ended, but 100 ms after
   // it came at the latest, so that a slow host takes several at once. 0: none.
   std::uintptr_t sequence = 0;
-  std::chrono::milliseconds timeout{60'000};  // total; connecting alone at most 10 s
+  std::chrono::milliseconds timeout{60'000};  // total, waiting included; connecting alone at most 10 s
   // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.
   std::uint32_t leastBytesPerSecond = 0;
-  std::size_t mostResponseBytes = 16u
-                                  << 20;  // beyond it the transfer ends with an error; counted as bytes come
+  // Of the answer's body, counted as bytes come; beyond it the connection is closed. Headers: 64 KiB and 256
+  // lines at most.
+  std::size_t mostResponseBytes = 16u << 20;
 };
 
 struct HTTPResponse {
   int status = 0;
-  HTTPHeaders headers;  // of the last answer, names as sent
+  HTTPHeaders headers;  // of the last answer, names as sent; none where the answer is not kept
   std::string body;
 
   // The first value under this name, letter case ignored.
@@ -64,7 +65,8 @@ struct HTTPResponse {
 
 struct HTTPError {
   enum class Kind {
-    transport,  // refused, unresolvable, not trusted, cut, timed out, too large; not https
+    transport,  // refused, unresolvable, not trusted, cut, timed out, headers over their bound; not https
+    tooLarge,   // the answer is over its bound; `status` is the answer's
     tooMany,    // over the lane's bound; nothing was sent
     shortage,   // no descriptor, thread or memory for it just now; nothing was sent
     stopping,   // the daemon is stopping
@@ -97,8 +99,8 @@ struct HTTPClientSettings {
   std::string extraCertificatesPath;  // PEM, trusted beside the system's; no such file: none
 };
 
-// libcurl's multi interface on one thread, which starts with the first request. Never forks; SIGPIPE must be
-// ignored.
+// libcurl's multi interface on one thread, which starts with the first request; where it cannot, the next
+// request tries again. Never forks; SIGPIPE must be ignored.
 class CurlHTTPClient final : public HTTPClient {
  public:
   explicit CurlHTTPClient(HTTPClientSettings settings);

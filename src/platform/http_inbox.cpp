@@ -1,23 +1,17 @@
 // The HTTP thread's inbox. Any thread.
 #include "platform/http_inbox.h"
 
-#include <utility>
-
 namespace veltrad::platform {
 
-bool HTTPInbox::add(std::unique_ptr<CurlTransfer> transfer) {
+HTTPInbox::Added HTTPInbox::add(Transfers& transfer) {
   const Lock lock(_mutex);
-  if (transfer->lane() == HTTPRequest::Lane::event) {
-    if (_events >= kMostEvents || transfer->bodySize() > kMostEventBytes - _eventBytes) {
-      transfer->refuse({HTTPError::Kind::tooMany, "Too many posts under way"});
-    } else {
-      ++_events;
-      _eventBytes += transfer->bodySize();
-    }
+  if (transfer.front()->lane() == HTTPRequest::Lane::event) {
+    if (_events >= kMostEvents) return Added::refused;
+    ++_events;
   }
   ++_underWay;
-  _arrived.push_back(std::move(transfer));
-  return _arrived.size() == 1;  // else the thread is already on its way
+  _arrived.splice(_arrived.end(), transfer);
+  return _arrived.size() == 1 ? Added::first : Added::more;
 }
 
 void HTTPInbox::failBlocking() {
@@ -76,11 +70,10 @@ HTTPInbox::Taken HTTPInbox::take() {
   return taken;
 }
 
-void HTTPInbox::ended(const CurlTransfer& transfer) {
-  if (transfer.lane() != HTTPRequest::Lane::event || transfer.refused()) return;
+void HTTPInbox::ended(HTTPRequest::Lane lane) {
+  if (lane != HTTPRequest::Lane::event) return;
   const Lock lock(_mutex);
   --_events;
-  _eventBytes -= transfer.bodySize();
 }
 
 void HTTPInbox::completed() {

@@ -3,8 +3,8 @@
 
 #include <chrono>
 #include <cstdint>
+#include <list>
 #include <memory>
-#include <vector>
 
 #include "base/mutex.h"
 #include "platform/curl_transfer.h"
@@ -16,11 +16,14 @@ class HTTPInbox {
  public:
   using Time = CurlTransfer::Time;
 
+  // A list, so that handing one on needs no memory: what was admitted cannot be lost for want of it.
+  using Transfers = std::list<std::unique_ptr<CurlTransfer>>;
+  enum class Added { first, more, refused };
+
   static constexpr std::size_t kMostEvents = 1024;
-  static constexpr std::size_t kMostEventBytes = 64u << 20;
 
   struct Taken {
-    std::vector<std::unique_ptr<CurlTransfer>> transfers;
+    Transfers transfers;
     bool failBlocking = false;  // those that wait in perform() end
     bool stopping = false;      // everything ends
     bool last = false;          // and then the thread
@@ -28,9 +31,8 @@ class HTTPInbox {
 
   // Any thread; but for waits and questions the caller wakes the HTTP thread afterwards.
 
-  // Beyond its lane's bound the transfer is marked as refused; it is under way until it has been told so.
-  // False: the thread is already on its way.
-  bool add(std::unique_ptr<CurlTransfer> transfer);
+  // Takes the only one of `transfer`, unless its lane is full. `more`: the thread is already on its way.
+  Added add(Transfers& transfer);
   void failBlocking();
   bool blockingFails() const;
   void stop(bool forGood);
@@ -44,18 +46,17 @@ class HTTPInbox {
   // HTTP thread.
 
   Taken take();
-  // Before the completion: gives its share of the lane's bound back.
-  void ended(const CurlTransfer& transfer);
-  // After the completion.
+  // Before the completion: gives its place in the lane back.
+  void ended(HTTPRequest::Lane lane);
+  // After the completion, when what the request kept is free.
   void completed();
 
  private:
   mutable Mutex _mutex{LockRank::leaf};
   Condition _changed;
-  std::vector<std::unique_ptr<CurlTransfer>> _arrived GUARDED_BY(_mutex);
+  Transfers _arrived GUARDED_BY(_mutex);
   std::size_t _underWay GUARDED_BY(_mutex) = 0;  // all lanes, completions that still run included
   std::size_t _events GUARDED_BY(_mutex) = 0;
-  std::size_t _eventBytes GUARDED_BY(_mutex) = 0;
   std::uint64_t _tasksAdded GUARDED_BY(_mutex) = 0;
   std::uint64_t _tasksPassed GUARDED_BY(_mutex) = 0;
   bool _failBlocking GUARDED_BY(_mutex) = false;

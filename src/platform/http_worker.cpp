@@ -3,36 +3,32 @@
 
 #include <pthread.h>
 
-#include <cstdlib>
+#include <new>
 #include <utility>
+
+#include "platform/log.h"
 
 namespace veltrad::platform {
 
-HTTPWorker::HTTPWorker(HTTPInbox& inbox, std::string extraCertificatesPath)
-    : _inbox(inbox),
-      _multi(makeMulti()),
-      _wakeable(_curl.multiWakeup(_multi) == CURLM_OK),  // not without descriptors
-      _trust(std::move(extraCertificatesPath)) {}
+std::unique_ptr<HTTPWorker> HTTPWorker::make(HTTPInbox& inbox, std::string extraCertificatesPath) {
+  if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) return nullptr;
+  Multi multi(curl_multi_init(), curl_multi_cleanup);
+  // Without descriptors it is made all the same, but nobody could wake it.
+  if (!multi || curl_multi_wakeup(multi.get()) != CURLM_OK) return nullptr;
+  curl_multi_setopt(multi.get(), CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
+  curl_multi_setopt(multi.get(), CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPWaiting::kConnections));
+  curl_multi_setopt(multi.get(), CURLMOPT_MAXCONNECTS, 8L);  // kept alive
+  return std::unique_ptr<HTTPWorker>(
+      new HTTPWorker(inbox, std::move(multi), std::move(extraCertificatesPath)));
+}
 
-CURLM* HTTPWorker::makeMulti() const {
-  if (_curl.globalInit(CURL_GLOBAL_DEFAULT) != CURLE_OK)
-    std::abort();  // counted: each client has its own pair
-  CURLM* multi = _curl.multiInit();
-  if (multi == nullptr) std::abort();
-  _curl.multiSetopt(multi, CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
-  _curl.multiSetopt(multi, CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPWaiting::kConnections));
-  _curl.multiSetopt(multi, CURLMOPT_MAXCONNECTS, 8L);  // kept alive
-  return multi;
+HTTPWorker::HTTPWorker(HTTPInbox& inbox, Multi multi, std::string extraCertificatesPath)
+    : _inbox(inbox), _trust(std::move(extraCertificatesPath)), _multi(std::move(multi)) {
+  _idleHandles.reserve(kIdleHandles);
 }
 
 HTTPWorker::~HTTPWorker() {
-  for (CURL* easy : _idleHandles) _curl.easyCleanup(easy);
-  _curl.multiCleanup(_multi);
-  _curl.globalCleanup();
-}
-
-void HTTPWorker::wake() {
-  _curl.multiWakeup(_multi);
+  for (CURL* easy : _idleHandles) curl_easy_cleanup(easy);
 }
 
 void HTTPWorker::run() {
@@ -46,7 +42,7 @@ void HTTPWorker::run() {
     else if (taken.failBlocking)
       end([](const CurlTransfer& transfer) { return transfer.blocking(); });
     int running = 0;
-    _curl.multiPerform(_multi, &running);
+    curl_multi_perform(_multi.get(), &running);
     finish();
     endExpired();
     startNext();
@@ -54,57 +50,74 @@ void HTTPWorker::run() {
   }
 }
 
-void HTTPWorker::arrive(std::vector<Transfer> transfers) {
-  for (Transfer& transfer : transfers) {
-    if (transfer->refused()) {
-      HTTPError error = *transfer->refused();
-      complete(std::move(transfer), Failure{std::move(error)});
-    } else {
-      _waiting.add(std::move(transfer));
+void HTTPWorker::arrive(HTTPInbox::Transfers transfers) {
+  while (!transfers.empty()) {
+    try {
+      _waiting.add(transfers);
+    } catch (const std::bad_alloc&) {
+      Transfer transfer = std::move(transfers.front());
+      transfers.pop_front();
+      complete(std::move(transfer), Failure{CurlTransfer::outOfMemory()});
     }
   }
 }
 
 void HTTPWorker::end(const HTTPWaiting::Predicate& matches) {
-  std::vector<Transfer> ending = _waiting.take(matches);
+  for (Transfer& transfer : _waiting.take(matches))
+    complete(std::move(transfer), Failure{CurlTransfer::stopping()});
   for (auto at = _running.begin(); at != _running.end();) {
     if (!matches(*at->second)) {
       ++at;
       continue;
     }
-    _curl.multiRemoveHandle(_multi, at->first);
+    Transfer transfer = std::move(at->second);
+    curl_multi_remove_handle(_multi.get(), at->first);
     keepHandle(at->first);
-    _waiting.ended(*at->second);
-    ending.push_back(std::move(at->second));
     at = _running.erase(at);
+    _waiting.ended(*transfer);
+    complete(std::move(transfer), Failure{CurlTransfer::stopping()});
   }
-  for (Transfer& transfer : ending) complete(std::move(transfer), Failure{CurlTransfer::stopping()});
 }
 
 void HTTPWorker::startNext() {
-  const auto now = std::chrono::steady_clock::now();
-  while (Transfer transfer = _waiting.next(now)) startOne(std::move(transfer));
+  try {
+    const auto now = std::chrono::steady_clock::now();
+    while (Transfer transfer = _waiting.next(now)) startOne(std::move(transfer));
+  } catch (const std::bad_alloc&) {
+    // They go on waiting, at most until their time is over.
+  }
 }
 
 void HTTPWorker::startOne(Transfer transfer) {
-  CURL* easy = _idleHandles.empty() ? _curl.easyInit() : _idleHandles.back();
-  if (!_idleHandles.empty()) _idleHandles.pop_back();
-  const bool ready = easy != nullptr &&
-                     transfer->attach(_curl, easy, _trust, _connections, std::chrono::steady_clock::now()) &&
-                     _curl.multiAddHandle(_multi, easy) == CURLM_OK;
-  if (ready) {
-    _running.emplace(easy, std::move(transfer));
-    return;
+  const bool idle = !_idleHandles.empty();
+  CURL* easy = idle ? _idleHandles.back() : curl_easy_init();
+  if (idle) _idleHandles.pop_back();
+  if (easy != nullptr) {
+    if (runs(easy, transfer)) return;
+    keepHandle(easy);
   }
-  if (easy != nullptr) keepHandle(easy);
   _waiting.ended(*transfer);
-  complete(std::move(transfer),
-           Failure{HTTPError{HTTPError::Kind::transport, _curl.easyStrerror(CURLE_OUT_OF_MEMORY)}});
+  complete(std::move(transfer), Failure{CurlTransfer::outOfMemory()});
+}
+
+// False: there is no memory for it, and nothing has changed.
+bool HTTPWorker::runs(CURL* easy, Transfer& transfer) {
+  try {
+    if (!transfer->attach(easy, _trust, _connections, std::chrono::steady_clock::now())) return false;
+    Transfer& place = _running[easy];
+    if (curl_multi_add_handle(_multi.get(), easy) == CURLM_OK) {
+      place = std::move(transfer);
+      return true;
+    }
+    _running.erase(easy);
+  } catch (const std::bad_alloc&) {
+  }
+  return false;
 }
 
 void HTTPWorker::finish() {
   int left = 0;
-  while (const CURLMsg* message = _curl.multiInfoRead(_multi, &left)) {
+  while (const CURLMsg* message = curl_multi_info_read(_multi.get(), &left)) {
     if (message->msg != CURLMSG_DONE) continue;
     CURL* easy = message->easy_handle;
     const CURLcode code = message->data.result;
@@ -112,7 +125,7 @@ void HTTPWorker::finish() {
     Transfer transfer = std::move(found->second);
     _running.erase(found);
     HTTPResult result = transfer->result(code, easy);
-    _curl.multiRemoveHandle(_multi, easy);
+    curl_multi_remove_handle(_multi.get(), easy);
     keepHandle(easy);
     if (code == CURLE_ABORTED_BY_CALLBACK && transfer->metEndedConnection()) {
       startOne(std::move(transfer));
@@ -128,30 +141,33 @@ void HTTPWorker::endExpired() {
   if (_waiting.empty()) return;
   const auto now = std::chrono::steady_clock::now();
   for (Transfer& transfer : _waiting.take([now](const CurlTransfer& t) { return t.expired(now); })) {
-    HTTPError error = transfer->timedOutWaiting();
-    complete(std::move(transfer), Failure{std::move(error)});
+    HTTPResult timedOut = transfer->timedOutWaiting();
+    complete(std::move(transfer), std::move(timedOut));
   }
 }
 
 void HTTPWorker::poll() {
-  constexpr int kCheckWaiting = 50, kUnwoken = 100,
-                kIdle = 3'600'000;  // ms; libcurl's own timers come first
-  const int most = !_wakeable ? kUnwoken : _waiting.empty() ? kIdle : kCheckWaiting;
-  _curl.multiPoll(_multi, nullptr, 0, most, nullptr);
+  constexpr int kCheckWaiting = 50, kIdle = 3'600'000;  // ms; libcurl's own timers come first
+  curl_multi_poll(_multi.get(), nullptr, 0, _waiting.empty() ? kIdle : kCheckWaiting, nullptr);
 }
 
 void HTTPWorker::complete(Transfer transfer, HTTPResult result) {
-  _inbox.ended(*transfer);
-  transfer->complete(std::move(result));
+  _inbox.ended(transfer->lane());
+  try {
+    transfer->complete(std::move(result));
+  } catch (const std::bad_alloc&) {
+    logError("An answer could not be handled: out of memory");
+  }
+  transfer.reset();
   _inbox.completed();
 }
 
 void HTTPWorker::keepHandle(CURL* easy) {
-  _curl.easyReset(easy);
+  curl_easy_reset(easy);
   if (_idleHandles.size() < kIdleHandles)
     _idleHandles.push_back(easy);
   else
-    _curl.easyCleanup(easy);
+    curl_easy_cleanup(easy);
 }
 
 }  // namespace veltrad::platform

@@ -8,7 +8,6 @@
 #include <unordered_map>
 #include <vector>
 
-#include "platform/curl_library.h"
 #include "platform/curl_transfer.h"
 #include "platform/http_inbox.h"
 #include "platform/http_waiting.h"
@@ -17,10 +16,12 @@
 
 namespace veltrad::platform {
 
-// Everything but wake() on the HTTP thread. `inbox` must outlive it.
+// Everything but make() and wake() on the HTTP thread. `inbox` must outlive it. Memory that is short ends the
+// transfer that needs it, not the thread.
 class HTTPWorker {
  public:
-  HTTPWorker(HTTPInbox& inbox, std::string extraCertificatesPath);
+  // Null: libcurl has no memory or descriptors for it just now. libcurl stays initialised.
+  static std::unique_ptr<HTTPWorker> make(HTTPInbox& inbox, std::string extraCertificatesPath);
   ~HTTPWorker();
   HTTPWorker(const HTTPWorker&) = delete;
   HTTPWorker& operator=(const HTTPWorker&) = delete;
@@ -28,33 +29,31 @@ class HTTPWorker {
   // Returns when the inbox says it was the last time and nothing is left.
   void run();
   // Any thread, as long as the object lives.
-  void wake();
+  void wake() { curl_multi_wakeup(_multi.get()); }
 
  private:
-  using Transfer = std::unique_ptr<CurlTransfer>;
+  using Multi = std::unique_ptr<CURLM, decltype(&curl_multi_cleanup)>;
+  using Transfer = HTTPWaiting::Transfer;
   static constexpr std::size_t kIdleHandles = 8;
 
-  CURLM* makeMulti() const;
-  void arrive(std::vector<Transfer> transfers);
+  HTTPWorker(HTTPInbox& inbox, Multi multi, std::string extraCertificatesPath);
+  void arrive(HTTPInbox::Transfers transfers);
   void end(const HTTPWaiting::Predicate& matches);
   void startNext();
   void startOne(Transfer transfer);
+  bool runs(CURL* easy, Transfer& transfer);
   void finish();
   void endExpired();
   void poll();
   void complete(Transfer transfer, HTTPResult result);
   void keepHandle(CURL* easy);
 
-  // constant after construction
+  // HTTP thread only, but for the inbox and wake()
   HTTPInbox& _inbox;
-  const CurlLibrary _curl;
-  CURLM* const _multi;
-  const bool _wakeable;
-
-  // HTTP thread only
   TrustStore _trust;
   HTTPWaiting _waiting;
   KeptConnections _connections;
+  const Multi _multi;  // before what it uses goes
   std::unordered_map<CURL*, Transfer> _running;
   std::vector<CURL*> _idleHandles;  // their set-up costs more than a reset
 };

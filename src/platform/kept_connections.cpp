@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <new>
 
 namespace veltrad::platform {
 
@@ -28,6 +29,12 @@ bool somethingWaits(curl_socket_t socket) {
 }  // namespace
 
 curl_socket_t KeptConnections::open(const curl_sockaddr& address) {
+  try {
+    _sockets.reserve(_sockets.size() + 1);
+  } catch (const std::bad_alloc&) {
+    errno = ENOMEM;
+    return CURL_SOCKET_BAD;
+  }
   const curl_socket_t made = socket(address.family, address.socktype | SOCK_CLOEXEC, address.protocol);
   if (made != CURL_SOCKET_BAD) _sockets.push_back(made);
   return made;

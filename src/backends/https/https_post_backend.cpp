@@ -19,6 +19,7 @@ constexpr std::uint16_t kSessionTypeStop = 1;
 const char* reasonOf(platform::HTTPError::Kind kind) {
   switch (kind) {
     case platform::HTTPError::Kind::transport:
+    case platform::HTTPError::Kind::tooLarge:
       return "event lost: the post failed";
     case platform::HTTPError::Kind::tooMany:
       return "event lost: too many posts under way";

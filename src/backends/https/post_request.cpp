@@ -22,6 +22,7 @@ platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string 
   request.method = platform::HTTPRequest::Method::post;
   request.lane = platform::HTTPRequest::Lane::event;
   request.url = std::move(url);
+  request.keepsAnswer = false;
 
   auto compressed = gzipDeflate(json);
   const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
