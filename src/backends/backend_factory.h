@@ -41,6 +41,7 @@ struct BackendServices {
   const Veltra& library;
   platform::WorkPool& pool;
   platform::LentFiles& lentFiles;
+  std::string scratchDirectory = "/tmp";  // for files without a name
 };
 
 class BackendFactory {

@@ -10,7 +10,7 @@ Daemon::Daemon(platform::Services& services)
       _messageLog(services.clock, services.root.messageLogDirectory()),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _device, _library,
-                services.pool, services.lentFiles}),
+                services.pool, services.lentFiles, services.root.preferencesDirectory()}),
       _storebags(services.http, _settings, _library),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
               services.counters, _flushes, _messageLog},

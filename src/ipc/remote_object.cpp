@@ -35,10 +35,11 @@ void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, do
   }
 }
 
-void sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
+bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
   Dictionary body{{"op", "removeUploadedFile:"}};
   body.set("args", Dictionary{{"call", callID}});
-  out.sendEvent(makeFrame(FrameKind::event, 0, std::move(body)));
+  // Within the bound of replies: it is worth as much as the one that follows it.
+  return out.sendReply(makeFrame(FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }
 
 }  // namespace veltrad::ipc

@@ -27,6 +27,6 @@ class RemoteObject final : public ClientSessionReplyInterface {
 };
 
 // Asks the client to remove the file that it uploads with that call. No answer is awaited.
-void sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID);
+bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID);
 
 }  // namespace veltrad::ipc

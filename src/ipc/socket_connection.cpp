@@ -185,8 +185,8 @@ bool SocketConnection::runFrame(const Frame& frame) {
 // What came with the frame is lent for the call, whose reply follows a request to remove the file.
 std::optional<std::string> SocketConnection::runCall(const Frame& frame, platform::FileDescriptor lent) {
   if (!lent.isOpen()) return dispatch(frame);
-  const auto loan = _lentFiles.lend(std::move(lent), [out = _out, callID = frame.header.callID] {
-    if (callID != 0) sendRemoveUploadedFile(*out, callID);
+  const auto loan = _lentFiles.lend(std::move(lent), _peer.pid, [out = _out, callID = frame.header.callID] {
+    return callID != 0 && sendRemoveUploadedFile(*out, callID);
   });
   return dispatch(frame, loan.token());
 }

@@ -8,6 +8,8 @@
 #include <cstring>
 #include <tuple>
 
+#include "platform/file_origin.h"
+
 namespace veltrad::ipc {
 
 namespace {
@@ -28,7 +30,11 @@ bool takeControl(msghdr& message, std::deque<platform::FileDescriptor>& into) {
     for (std::size_t i = 0; i < count; ++i) {
       int number = -1;
       std::memcpy(&number, CMSG_DATA(part) + i * sizeof number, sizeof number);
-      into.emplace_back(number);
+      platform::FileDescriptor came(number);
+      // Closed at once, or a client that lends its own end would keep its connection. Its place stays taken:
+      // the frame that announced it runs without a file.
+      if (platform::isNoRegularFile(number)) came.reset();
+      into.push_back(std::move(came));
     }
   }
   return (message.msg_flags & MSG_CTRUNC) == 0 && into.size() <= kMostDescriptors;

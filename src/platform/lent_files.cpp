@@ -5,9 +5,9 @@
 
 namespace veltrad::platform {
 
-LentFiles::Loan LentFiles::lend(FileDescriptor file, std::function<void()> askForRemoval) {
+LentFiles::Loan LentFiles::lend(FileDescriptor file, pid_t lender, std::function<bool()> askForRemoval) {
   std::string token = randomUUIDText();
-  auto lent = std::make_shared<const LentFile>(std::move(file), std::move(askForRemoval));
+  auto lent = std::make_shared<const LentFile>(std::move(file), lender, std::move(askForRemoval));
   const Lock held(_mutex);
   _files.emplace(token, std::move(lent));
   return Loan(*this, std::move(token));

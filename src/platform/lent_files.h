@@ -9,6 +9,7 @@
 
 #include "base/mutex.h"
 #include "platform/file_descriptor.h"
+#include "platform/file_origin.h"
 
 namespace veltrad::platform {
 
@@ -16,16 +17,20 @@ namespace veltrad::platform {
 // owner.
 class LentFile {
  public:
-  LentFile(FileDescriptor file, std::function<void()> askForRemoval)
-      : _file(std::move(file)), _askForRemoval(std::move(askForRemoval)) {}
+  // `askForRemoval` is true where the request is on its way.
+  LentFile(FileDescriptor file, pid_t lender, std::function<bool()> askForRemoval)
+      : _file(std::move(file)), _lender(lender), _askForRemoval(std::move(askForRemoval)) {}
 
   int descriptor() const { return _file.get(); }
-  // Asks the lender to remove its file, without waiting; the lender may refuse.
-  void askForRemoval() const { _askForRemoval(); }
+  // To be asked before anything else is done with the descriptor.
+  FileOrigin origin() const { return FileOrigin::of(_file.get(), _lender); }
+  // Asks the lender to remove its file, without waiting; the lender may refuse. False: it cannot be asked.
+  [[nodiscard]] bool askForRemoval() const { return _askForRemoval(); }
 
  private:
   const FileDescriptor _file;
-  const std::function<void()> _askForRemoval;
+  const pid_t _lender;
+  const std::function<bool()> _askForRemoval;
 };
 
 // Job: keeps what is lent under its token until the loan ends. Outlives its loans. Its lock is a leaf.
@@ -45,7 +50,7 @@ class LentFiles {
     const std::string _token;
   };
 
-  [[nodiscard]] Loan lend(FileDescriptor file, std::function<void()> askForRemoval);
+  [[nodiscard]] Loan lend(FileDescriptor file, pid_t lender, std::function<bool()> askForRemoval);
   // Null: nothing is lent under this token.
   std::shared_ptr<const LentFile> consume(const std::string& token) const;
 

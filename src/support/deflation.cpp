@@ -50,7 +50,6 @@ const char* shown(const char* message) {
 }
 
 int windowBits(Deflation::Wrapper wrapper) {
-  if (wrapper == Deflation::Wrapper::none) return -kWindowBits;
   return wrapper == Deflation::Wrapper::gzip ? kWindowBits + kGzipWrapper : kWindowBits;
 }
 
@@ -64,17 +63,21 @@ bool Deflation::begin(Wrapper wrapper) {
   const int result = deflateInit2_(&_stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, windowBits(wrapper),
                                    kMemoryLevel, Z_DEFAULT_STRATEGY, kZlibVersion, sizeof _stream);
   _begun = result == Z_OK;
-  if (!_begun) sayInitialisationFailed(result, _stream.msg);
+  if (!_begun) {
+    logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",
+             textAtInitialisation(result), shown(_stream.msg));
+  }
   return _begun;
 }
 
-bool Deflation::append(int flush, std::string& buffer, std::string& output) {
+bool Deflation::append(int flush, std::string& buffer, const ByteSink& sink) {
   int result = Z_OK;
   do {
     _stream.next_out = reinterpret_cast<Bytef*>(buffer.data());
     _stream.avail_out = static_cast<uInt>(buffer.size());
     result = deflate(&_stream, flush);
-    output.append(buffer, 0, buffer.size() - _stream.avail_out);
+    const std::size_t made = buffer.size() - _stream.avail_out;
+    if (made > 0 && !sink(std::string_view(buffer).substr(0, made))) return false;
   } while (result == Z_OK && _stream.avail_out == 0);
   const bool nothingToDo = result == Z_BUF_ERROR && flush != Z_FINISH;
   return nothingToDo || !failed(result);
@@ -85,11 +88,6 @@ bool Deflation::failed(int result) const {
   logError("compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
            textDuringCompression(result), shown(_stream.msg));
   return true;
-}
-
-void Deflation::sayInitialisationFailed(int result, const char* message) {
-  logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",
-           textAtInitialisation(result), shown(message));
 }
 
 }  // namespace veltrad

@@ -4,14 +4,19 @@
 
 #include <zlib.h>
 
+#include <functional>
 #include <string>
+#include <string_view>
 
 namespace veltrad {
+
+// Takes the next bytes of an output. False: it can take no more, and a line has said why.
+using ByteSink = std::function<bool(std::string_view bytes)>;
 
 // What goes wrong is one error line, here and nowhere else. Ends the stream with itself.
 class Deflation {
  public:
-  enum class Wrapper { gzip, zlib, none };
+  enum class Wrapper { gzip, zlib };
 
   Deflation() = default;
   ~Deflation();
@@ -20,12 +25,11 @@ class Deflation {
 
   bool begin(Wrapper wrapper);
   z_stream& stream() { return _stream; }
-  // Takes what the stream has been given and appends what comes out, all of it where `flush` says so;
+  // Takes what the stream has been given and hands on what comes out, all of it where `flush` says so;
   // `buffer` is room of any size. False: it failed.
-  bool append(int flush, std::string& buffer, std::string& output);
+  bool append(int flush, std::string& buffer, const ByteSink& sink);
   // Says what such a result of deflate() means; false where it is none of the failures.
   bool failed(int result) const;
-  static void sayInitialisationFailed(int result, const char* message);
 
  private:
   z_stream _stream{};

@@ -6,15 +6,11 @@
 #include <new>
 
 #include "platform/log.h"
-#include "support/deflation.h"
-#include "support/gzip_lanes.h"
 
 namespace veltrad {
 namespace {
 
-constexpr std::size_t kPieceBytes = 256u << 10;
-// From here on a second thread is worth its price.
-constexpr std::size_t kBytesForLanes = 4u << 20;
+constexpr std::size_t kPieceBytes = 128u << 10;
 
 // Fills `output` from its start; the number of bytes produced is stream.total_out. Z_STREAM_END: all is
 // there.
@@ -34,56 +30,44 @@ void sayEmpty() {
   logError("compressDataWithZlibOrGzip: Cannot compress empty Torvane");
 }
 
+void sayNoMemory() {
+  logError("compressDataWithZlibOrGzip: Not enough memory to compress");
+}
+
 void sayCompressed(std::size_t from, std::size_t to) {
   logDebug("compressDataWithZlibOrGzip: Compressed file from %u to %u", static_cast<unsigned>(from),
            static_cast<unsigned>(to));
 }
 
 // False, and a line has said why.
-bool deflateAll(const ByteSource& source, std::string& output, std::size_t& taken) {
+bool deflateAll(const ByteSource& source, const ByteSink& sink) {
   Deflation deflation;
   if (!deflation.begin(Deflation::Wrapper::gzip)) return false;
   std::string piece(kPieceBytes, '\0'), buffer(kPieceBytes, '\0');
+  std::size_t taken = 0, made = 0;
+  const ByteSink counting = [&](std::string_view bytes) {
+    made += bytes.size();
+    return sink(bytes);
+  };
   std::optional<std::size_t> count;
   do {
     count = source(piece.data(), piece.size());
     if (!count) return false;
     taken += *count;
+    if (taken == 0) {
+      sayEmpty();
+      return false;
+    }
     deflation.stream().next_in = reinterpret_cast<Bytef*>(piece.data());
     deflation.stream().avail_in = static_cast<uInt>(*count);
-    if (!deflation.append(*count == 0 ? Z_FINISH : Z_NO_FLUSH, buffer, output)) return false;
+    if (!deflation.append(*count == 0 ? Z_FINISH : Z_NO_FLUSH, buffer, counting)) return false;
   } while (*count > 0);
+  sayCompressed(taken, made);
   return true;
 }
 
-std::optional<std::string> deflateSource(const ByteSource& source, std::size_t expected) {
-  std::string output;
-  // Only what is written to costs memory, so there is room to spare for blocks that end early.
-  output.reserve(compressBound(expected) + expected / 256);
-  std::size_t taken = 0;
-  const bool done =
-      expected < kBytesForLanes ? deflateAll(source, output, taken) : GzipLanes(source, output).run(taken);
-  if (!done) return std::nullopt;
-  if (taken == 0) {
-    sayEmpty();
-    return std::nullopt;
-  }
-  sayCompressed(taken, output.size());
-  return output;
-}
-
-}  // namespace
-
-std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view bytes) {
-  if (bytes.empty()) {
-    sayEmpty();
-    return std::nullopt;
-  }
-  // zlib counts its input in 32 bits; what does not fit must not be cut off silently.
-  if (bytes.size() > std::numeric_limits<uInt>::max()) {
-    Deflation::sayInitialisationFailed(Z_STREAM_ERROR, nullptr);
-    return std::nullopt;
-  }
+// Within what zlib counts.
+std::optional<std::string> deflateBytes(bool gzip, std::string_view bytes) {
   Deflation deflation;
   if (!deflation.begin(gzip ? Deflation::Wrapper::gzip : Deflation::Wrapper::zlib)) return std::nullopt;
   z_stream& stream = deflation.stream();
@@ -97,16 +81,37 @@ std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_vie
   return output;
 }
 
+}  // namespace
+
+std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view bytes) {
+  if (bytes.empty()) {
+    sayEmpty();
+    return std::nullopt;
+  }
+  // zlib counts its input in 32 bits; what does not fit must not be cut off silently.
+  if (bytes.size() > std::numeric_limits<uInt>::max()) {
+    logError("compressDataWithZlibOrGzip: Cannot compress %zu bytes: at most %u", bytes.size(),
+             std::numeric_limits<uInt>::max());
+    return std::nullopt;
+  }
+  try {
+    return deflateBytes(gzip, bytes);
+  } catch (const std::bad_alloc&) {
+    sayNoMemory();
+    return std::nullopt;
+  }
+}
+
 std::optional<std::string> gzipDeflate(std::string_view bytes) {
   return compressDataWithZlibOrGzip(true, bytes);
 }
 
-std::optional<std::string> gzipDeflate(const ByteSource& source, std::size_t expected) {
+bool gzipDeflate(const ByteSource& source, const ByteSink& sink) {
   try {
-    return deflateSource(source, expected);
+    return deflateAll(source, sink);
   } catch (const std::bad_alloc&) {
-    Deflation::sayInitialisationFailed(Z_MEM_ERROR, nullptr);
-    return std::nullopt;
+    sayNoMemory();
+    return false;
   }
 }
 

@@ -23,7 +23,9 @@ FileSnapshot::Content FileSnapshot::content() const {
 
 std::optional<std::size_t> FileSnapshot::read(char* place, std::size_t room) {
   const auto count = readAt(_at, place, room);
-  if (count) _at += static_cast<off_t>(*count);
+  if (!count) return std::nullopt;
+  if (*count == 0 && _at < _size) _endedEarly = true;
+  _at += static_cast<off_t>(*count);
   return count;
 }
 
@@ -39,7 +41,7 @@ std::optional<std::size_t> FileSnapshot::readAt(off_t at, char* place, std::size
 
 bool FileSnapshot::changed() const {
   struct stat facts {};
-  return ::fstat(_descriptor, &facts) != 0 || facts.st_size != _size ||
+  return _endedEarly || ::fstat(_descriptor, &facts) != 0 || facts.st_size != _size ||
          facts.st_mtim.tv_sec != _modified.tv_sec || facts.st_mtim.tv_nsec != _modified.tv_nsec;
 }
 

@@ -25,7 +25,7 @@ class FileSnapshot {
   // At most `room` bytes from where the last call ended; 0 at the end, which a file that was shortened has
   // early. Nothing: it cannot be read, and errno says why.
   std::optional<std::size_t> read(char* place, std::size_t room);
-  // The file is no longer what it was at the beginning.
+  // The file is no longer what it was at the beginning, or has ended before the size that it has.
   bool changed() const;
 
  private:
@@ -38,6 +38,7 @@ class FileSnapshot {
   off_t _size;
   timespec _modified;
   off_t _at = 0;
+  bool _endedEarly = false;
 };
 
 }  // namespace veltrad

@@ -1,45 +1,85 @@
 // How many files are uploaded at one time. Any thread.
 #pragma once
 
+#include <chrono>
 #include <cstddef>
+#include <list>
+#include <map>
+#include <optional>
+#include <utility>
 
 #include "base/mutex.h"
+#include "platform/http_client.h"
 
 namespace veltrad {
 
-// One for all upload back ends, which it outlives. An upload holds its compressed file in memory from the
-// first byte read to the server's answer, so only as many may begin as may be on their way.
+// One for all upload back ends, which it outlives: an upload holds a place, its buffers and its compressed
+// file from the first byte read to the server's answer. One user never holds all places.
 class FileUploads {
  public:
-  static constexpr std::size_t kMostAtOnce = 2;
+  static constexpr std::size_t kMostAtOnce = 3;
+  static constexpr std::size_t kMostOfOneUser = 2;
+  // Who has no account counts as one user.
+  using User = std::optional<unsigned>;
 
-  // Waits for one of the places, and gives it back at its end.
+  // Gives the place back at its end.
   class Place {
    public:
-    explicit Place(FileUploads& uploads) : _uploads(uploads) { _uploads.enter(); }
-    ~Place() { _uploads.leave(); }
-    Place(const Place&) = delete;
-    Place& operator=(const Place&) = delete;
+    Place(FileUploads& uploads, User user) : _uploads(&uploads), _user(user) {}
+    Place(Place&& other) noexcept : _uploads(std::exchange(other._uploads, nullptr)), _user(other._user) {}
+    Place& operator=(Place&&) = delete;
+    ~Place() {
+      if (_uploads) _uploads->leave(_user);
+    }
 
    private:
-    FileUploads& _uploads;
+    FileUploads* _uploads;
+    User _user;
   };
 
- private:
-  void enter() {
+  // Waits for a place: first come, first served, but nobody waits for a user who has his share. Nothing: the
+  // daemon is stopping, which ends the wait even if no place is ever given back.
+  std::optional<Place> enter(User user, const platform::HTTPClient& http) {
     const Lock held(_mutex);
-    while (_underWay == kMostAtOnce) _changed.wait(_mutex);
+    const auto self = _waiting.insert(_waiting.end(), user);
+    while (!http.stopping() && !isNext(self)) {
+      _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + kLookAgain);
+    }
+    _waiting.erase(self);
+    _changed.notifyAll();  // the next may enter, too
+    if (http.stopping()) return std::nullopt;
     ++_underWay;
+    ++_ofUser[user];
+    return std::optional<Place>(std::in_place, *this, user);
   }
-  void leave() {
+
+ private:
+  using Waiting = std::list<User>;
+  static constexpr std::chrono::milliseconds kLookAgain{100};
+
+  bool hasShare(User user) const REQUIRES(_mutex) {
+    const auto found = _ofUser.find(user);
+    return found != _ofUser.end() && found->second >= kMostOfOneUser;
+  }
+  bool isNext(Waiting::const_iterator self) const REQUIRES(_mutex) {
+    if (_underWay == kMostAtOnce) return false;
+    for (auto at = _waiting.begin(); at != _waiting.end(); ++at) {
+      if (!hasShare(*at)) return at == self;
+    }
+    return false;
+  }
+  void leave(User user) {
     const Lock held(_mutex);
     --_underWay;
-    _changed.notifyOne();
+    if (--_ofUser[user] == 0) _ofUser.erase(user);
+    _changed.notifyAll();
   }
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::size_t _underWay GUARDED_BY(_mutex) = 0;
+  std::map<User, std::size_t> _ofUser GUARDED_BY(_mutex);
+  Waiting _waiting GUARDED_BY(_mutex);  // in order of arrival
 };
 
 }  // namespace veltrad

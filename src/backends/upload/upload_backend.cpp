@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <cstring>
 
+#include "backends/upload/compressed_file.h"
 #include "backends/upload/file_snapshot.h"
 #include "backends/upload/file_uploads.h"
 #include "backends/upload/upload_request.h"
@@ -20,6 +21,24 @@ namespace {
 
 // What a server's answer holds where it has stored the file.
 constexpr std::string_view kConfirmation = "success";
+
+FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account) {
+  return account ? FileUploads::User(account->uid()) : std::nullopt;
+}
+
+// Of an exchange that ended without an answer.
+const char* fateAfter(platform::HTTPError::Kind kind) {
+  switch (kind) {
+    case platform::HTTPError::Kind::transport:
+      return "file lost: the exchange with the server failed";
+    case platform::HTTPError::Kind::tooMany:
+    case platform::HTTPError::Kind::shortage:
+      return "file lost: no exchange could begin for a shortage";
+    case platform::HTTPError::Kind::stopping:
+      return "file lost: the daemon is stopping";
+  }
+  return "";
+}
 
 void sayUnreadable(const std::string& path, int error) {
   logError("UploadBackend(uploadFileAtPath): File %s cannot be read: %s", path.c_str(), std::strerror(error));
@@ -48,7 +67,8 @@ UploadBackend::UploadBackend(const BackendServices& services, FileUploads& uploa
       _uploads(uploads),
       _http(services.http),
       _counters(services.counters),
-      _lentFiles(services.lentFiles) {}
+      _lentFiles(services.lentFiles),
+      _scratchDirectory(services.scratchDirectory) {}
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
@@ -57,15 +77,20 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   const auto lent = _lentFiles.consume(extensionToken);
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
-  const FileUploads::Place place(_uploads);
-  auto gzipped = compressed(*file, path);
-  if (!gzipped) return false;
-  auto request = uploadRequest(*url, {udid(), sessionID()}, path, std::move(*gzipped));
-  if (!request) {
-    logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
+  const auto place = _uploads.enter(userOf(memoryAccount()), _http);
+  if (!place) {
+    sayStopping();
     return false;
   }
-  _counters.count("file uploaded");
+  CompressedFile gzipped(_scratchDirectory);
+  if (!compress(*file, path, gzipped)) return false;
+  auto request = uploadRequest(*url, {udid(), sessionID()}, path);
+  if (!request) {
+    logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
+    _counters.count("file lost: its upload address makes no request");
+    return false;
+  }
+  gzipped.become(*request);
   if (confirms(*url, _http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
 }
@@ -73,6 +98,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
 // Nothing: it cannot be uploaded, which has been said and counted.
 std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile* lent,
                                                         const std::string& path) const {
+  if (comesFromOthers(lent, path)) return std::nullopt;
   const auto file = FileSnapshot::of(lent ? lent->descriptor() : -1);
   if (!file) {
     logError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
@@ -94,30 +120,67 @@ std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile
   return std::nullopt;
 }
 
-std::optional<std::string> UploadBackend::compressed(FileSnapshot& file, const std::string& path) const {
+// A program that serves a file need not answer, and even a look at the file would wait for it.
+bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::string& path) const {
+  if (!lent) return false;
+  const auto origin = lent->origin();
+  if (origin.kind != platform::FileOrigin::Kind::foreign) return false;
+  logError(
+      "UploadBackend(uploadFileAtPath): File %s lies on a file system of type %s, whose reads may never "
+      "end: only a copy of it can be uploaded",
+      path.c_str(), origin.fileSystem.c_str());
+  _counters.count("file refused: others serve its file system");
+  return true;
+}
+
+// False: it failed, which has been said and counted.
+bool UploadBackend::compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const {
+  const char* fate = "file lost: it could not be compressed";
   const auto next = [&](char* bytes, std::size_t room) -> std::optional<std::size_t> {
     if (_http.stopping()) {
-      logError("UploadBackend(uploadFileAtPath): The daemon is stopping");
+      fate = nullptr;
+      sayStopping();
       return std::nullopt;
     }
     const auto count = file.read(bytes, room);
-    if (!count) sayUnreadable(path, errno);
+    if (!count) {
+      sayUnreadable(path, errno);
+      fate = "file lost: it could not be read";
+    }
     return count;
   };
-  return gzipDeflate(next, static_cast<std::size_t>(file.size()));
+  const auto keep = [&](std::string_view bytes) {
+    if (into.append(bytes)) return true;
+    logError("UploadBackend(uploadFileAtPath): No room for the compressed bytes of %s in %s: %s",
+             path.c_str(), _scratchDirectory.c_str(), std::strerror(errno));
+    fate = "file lost: no room for its compressed bytes";
+    return false;
+  };
+  if (gzipDeflate(next, keep)) return true;
+  if (fate) _counters.count(fate);
+  return false;
 }
 
+void UploadBackend::sayStopping() const {
+  logError("UploadBackend(uploadFileAtPath): The daemon is stopping");
+  _counters.count("file lost: the daemon is stopping");
+}
+
+// Says and counts how the exchange ended, too.
 bool UploadBackend::confirms(const std::string& url, const platform::HTTPResult& answer) const {
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",
              answer.ok() ? "(null)" : answer.error().description.c_str());
+    _counters.count(answer.ok() ? "file not confirmed" : fateAfter(answer.error().kind));
     return false;
   }
   const std::string& body = answer.value().body;
   const bool text = isUTF8(body);
   logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", url.c_str(),
            text ? body.c_str() : "(undecodable)");
-  return text && body.find(kConfirmation) != std::string::npos;
+  const bool confirmed = text && body.find(kConfirmation) != std::string::npos;
+  _counters.count(confirmed ? "file uploaded" : "file not confirmed");
+  return confirmed;
 }
 
 void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& file,
@@ -128,8 +191,8 @@ void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& f
     _counters.count("file kept: it changed during its upload");
     return;
   }
-  lent.askForRemoval();
-  _counters.count("file confirmed: its removal was asked for");
+  _counters.count(lent.askForRemoval() ? "file confirmed: its removal was asked for"
+                                       : "file confirmed: its removal could not be asked for");
 }
 
 std::optional<std::string> UploadBackend::uploadURL() const {

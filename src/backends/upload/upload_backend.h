@@ -13,6 +13,7 @@
 
 namespace veltrad {
 
+class CompressedFile;
 class FileUploads;
 namespace platform {
 class LentFile;
@@ -42,8 +43,10 @@ class UploadBackend final : public VeltraBackend {
                 const Dictionary& profile, const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
-  std::optional<std::string> compressed(FileSnapshot& file, const std::string& path) const;
+  bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
+  bool compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const;
   bool confirms(const std::string& url, const platform::HTTPResult& answer) const;
+  void sayStopping() const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
   // Constant after construction.
@@ -51,6 +54,7 @@ class UploadBackend final : public VeltraBackend {
   platform::HTTPClient& _http;
   platform::Counters& _counters;
   platform::LentFiles& _lentFiles;
+  const std::string _scratchDirectory;
 
   mutable Mutex _urlMutex BACKEND_LOCK{LockRank::backend};
   std::optional<std::string> _uploadURL GUARDED_BY(_urlMutex);

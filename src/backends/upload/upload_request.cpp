@@ -32,7 +32,7 @@ std::string_view lastPathComponent(std::string_view path) {
 }
 
 std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
-                                                   std::string_view path, std::string gzipped) {
+                                                   std::string_view path) {
   const std::string name = std::string(lastPathComponent(path)) + ".gz";
   platform::HTTPRequest request;
   request.url =
@@ -43,7 +43,6 @@ std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL,
   request.method = platform::HTTPRequest::Method::post;
   request.lane = platform::HTTPRequest::Lane::upload;
   request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
-  request.body = std::move(gzipped);
   request.leastBytesPerSecond = kLeastBytesPerSecond;
   request.mostResponseBytes = kMostAnswerBytes;
   return request;

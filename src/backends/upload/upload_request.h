@@ -18,8 +18,8 @@ struct UploadIdentity {
   std::uint32_t sessionID = 0;
 };
 
-// The post of a gzipped file. Nothing: `uploadURL` and the rest make no URL.
+// The post of a gzipped file, but for its body. Nothing: `uploadURL` and the rest make no URL.
 std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
-                                                   std::string_view path, std::string gzipped);
+                                                   std::string_view path);
 
 }  // namespace veltrad
