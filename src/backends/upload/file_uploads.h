@@ -40,23 +40,30 @@ class FileUploads {
   // Waits for a place: first come, first served, but nobody waits for a user who has his share. Nothing: the
   // daemon is stopping, which ends the wait even if no place is ever given back.
   std::optional<Place> enter(User user, const platform::HTTPClient& http) {
-    const Lock held(_mutex);
-    const auto self = _waiting.insert(_waiting.end(), user);
-    while (!http.stopping() && !isNext(self)) {
+    const auto self = arrive(user);
+    while (true) {
+      const bool stopping = http.stopping();  // takes a lock of its own
+      const Lock held(_mutex);
+      if (stopping || isNext(self)) {
+        _waiting.erase(self);
+        _changed.notifyAll();  // the next may enter, too
+        if (stopping) return std::nullopt;
+        ++_underWay;
+        ++_ofUser[user];
+        return std::optional<Place>(std::in_place, *this, user);
+      }
       _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + kLookAgain);
     }
-    _waiting.erase(self);
-    _changed.notifyAll();  // the next may enter, too
-    if (http.stopping()) return std::nullopt;
-    ++_underWay;
-    ++_ofUser[user];
-    return std::optional<Place>(std::in_place, *this, user);
   }
 
  private:
   using Waiting = std::list<User>;
   static constexpr std::chrono::milliseconds kLookAgain{100};
 
+  Waiting::iterator arrive(User user) {
+    const Lock held(_mutex);
+    return _waiting.insert(_waiting.end(), user);
+  }
   bool hasShare(User user) const REQUIRES(_mutex) {
     const auto found = _ofUser.find(user);
     return found != _ofUser.end() && found->second >= kMostOfOneUser;
