@@ -3,12 +3,17 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <sys/random.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
+#include <cstdio>
 #include <system_error>
 
 #include "base/text.h"
+#include "client/lent_copy.h"
+#include "platform/file_origin.h"
 
 namespace veltrad {
 
@@ -30,6 +35,30 @@ const char* kindOfFile(mode_t mode) {
   if (S_ISFIFO(mode)) return "a FIFO";
   if (S_ISSOCK(mode)) return "a socket";
   return "a device";
+}
+
+// Nobody guesses it; with the file's name in it, so that a person who finds it knows what it is. Empty: the
+// system had no random bytes.
+std::string nameAside(const std::string& name) {
+  constexpr std::size_t kMostOfName = 200;  // with the rest below 255 bytes, what a directory can hold
+  std::uint64_t random[2];
+  if (::getrandom(random, sizeof random, GRND_NONBLOCK) != sizeof random) return {};
+  return fmt::format(".{}.{:016x}{:016x}", name.substr(0, kMostOfName), random[0], random[1]);
+}
+
+// 0, or an errno. Replaces nothing. Where the file system cannot promise that (NFS, many of FUSE), by a link.
+int moveTo(int directory, const std::string& from, const std::string& to) {
+  if (::renameat2(directory, from.c_str(), directory, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
+  if (errno != EINVAL && errno != ENOSYS) return errno;
+  if (::linkat(directory, from.c_str(), directory, to.c_str(), 0) != 0) return errno;
+  return ::unlinkat(directory, from.c_str(), 0) == 0 ? 0 : errno;
+}
+
+// 0, or an errno. To a name that nobody else uses, so that a plain rename serves, too.
+int moveAside(int directory, const std::string& from, const std::string& to) {
+  if (::renameat2(directory, from.c_str(), directory, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
+  if (errno != EINVAL && errno != ENOSYS) return errno;
+  return ::renameat(directory, from.c_str(), directory, to.c_str()) == 0 ? 0 : errno;
 }
 
 }  // namespace
@@ -68,25 +97,70 @@ void UploadedFile::open() {
     _problem = fmt::format("{} is empty.", shown);
   } else if (_facts.st_size > kMostBytes) {
     _problem = fmt::format("{} has {} bytes: at most {} are uploaded.", shown, _facts.st_size, kMostBytes);
+  } else {
+    copyIfServedByOthers();
   }
 }
 
+void UploadedFile::copyIfServedByOthers() {
+  using Kind = platform::FileOrigin::Kind;
+  const auto origin = platform::FileOrigin::of(_file.get(), 0);
+  if (origin.kind == Kind::local) return;
+  // What is stacked the daemon takes, if it sees the same mounts: it is worth a copy in memory alone.
+  if (origin.kind == Kind::stacked && _facts.st_size > kMostCopiedInMemory) return;
+  _copy = copyOfFile(_file.get(), _facts.st_size);
+  if (_copy.isOpen() || origin.kind == Kind::stacked) return;
+  _problem =
+      failed(fmt::format("lies on a file system of type {} and cannot be copied", origin.fileSystem), errno);
+}
+
+// A look at what a path names is out of date when the path is removed. So it is first moved where nobody else
+// finds it, and what that was is seen there.
 std::optional<std::string> UploadedFile::remove() const {
   struct stat now {};
   if (::fstatat(_directory.get(), _name.c_str(), &now, AT_SYMLINK_NOFOLLOW) != 0) {
     return failed("is stored, but cannot be found any more", errno);
   }
-  if (!S_ISREG(now.st_mode) || now.st_dev != _facts.st_dev || now.st_ino != _facts.st_ino) {
-    return fmt::format("{} is stored, but another file has taken its place, which stays.",
-                       escapedForLog(_absolutePath));
+  const std::string other = fmt::format("{} is stored, but another file has taken its place, which stays.",
+                                        escapedForLog(_absolutePath));
+  if (!isSame(now)) return other;
+  if (_copy.isOpen() && (now.st_size != _facts.st_size || now.st_mtim.tv_sec != _facts.st_mtim.tv_sec ||
+                         now.st_mtim.tv_nsec != _facts.st_mtim.tv_nsec)) {
+    return fmt::format("{} is stored, but has changed since, so it stays.", escapedForLog(_absolutePath));
   }
-  if (::unlinkat(_directory.get(), _name.c_str(), 0) != 0) {
-    return failed("is stored, but cannot be removed", errno);
+  const std::string aside = nameAside(_name);
+  const int error = aside.empty() ? EAGAIN : moveAside(_directory.get(), _name, aside);
+  if (error == ENOENT) return failed("is stored, but cannot be found any more", error);
+  if (error != 0) return failed("is stored, but cannot be removed", error);
+  if (::fstatat(_directory.get(), aside.c_str(), &now, AT_SYMLINK_NOFOLLOW) != 0) {
+    return failed("is stored, but cannot be found any more", errno);
+  }
+  if (!isSame(now)) {
+    const std::string problem = putBack(aside);
+    return problem.empty() ? other : problem;
+  }
+  if (::unlinkat(_directory.get(), aside.c_str(), 0) != 0) {
+    const int why = errno;
+    const std::string problem = putBack(aside);
+    return problem.empty() ? failed("is stored, but cannot be removed", why) : problem;
   }
   return std::nullopt;
 }
 
-std::string UploadedFile::failed(const char* what, int error) const {
+bool UploadedFile::isSame(const struct stat& other) const {
+  return S_ISREG(other.st_mode) && other.st_dev == _facts.st_dev && other.st_ino == _facts.st_ino;
+}
+
+// Empty: it stands under its name again.
+std::string UploadedFile::putBack(const std::string& aside) const {
+  const int error = moveTo(_directory.get(), aside, _name);
+  if (error == 0) return {};
+  return fmt::format("{} is stored; another file that had taken its place is now {} beside it: {}.",
+                     escapedForLog(_absolutePath), escapedForLog(aside),
+                     std::error_code(error, std::generic_category()).message());
+}
+
+std::string UploadedFile::failed(const std::string& what, int error) const {
   return fmt::format("{} {}: {}.", escapedForLog(_absolutePath), what,
                      std::error_code(error, std::generic_category()).message());
 }
