@@ -34,7 +34,7 @@ std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
   if (name == kVeltraBackendAmpery) {
     return AmperyBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""));
   }
-  if (name == kVeltraBackendMivo && _services.device.deviceProductType() != kProductTypeWithoutMivo) {
+  if (name == kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""),
                                      clientType);
   }

@@ -29,19 +29,21 @@ bool looksLikeHost(const std::string& text) {
   });
 }
 
+// Empty where there is none to go by; nothing: it cannot be read just now.
 std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::string& path) {
   const auto bytes = files.read(path);
   if (!bytes) {
+    if (bytes.error().passes()) return std::nullopt;
     if (bytes.error().kind != platform::FileFailure::Kind::notFound)
       logWarning("storebagServerURL: %s; using the built-in hosts", bytes.error().description.c_str());
-    return std::nullopt;
+    return Dictionary();
   }
   const auto list = parsePropertyList(bytes.value());
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
   if (dictionary == nullptr) {
     logWarning("storebagServerURL: %s: %s; using the built-in hosts", path.c_str(),
                list ? "not a dictionary" : list.error().detail.c_str());
-    return std::nullopt;
+    return Dictionary();
   }
   return *dictionary;
 }
@@ -52,44 +54,65 @@ ProcessSettings::ProcessSettings(platform::Preferences& preferences, DeviceIdent
                                  platform::FileStore& files, std::string deploymentPath)
     : _preferences(preferences), _device(device), _files(files), _deploymentPath(std::move(deploymentPath)) {}
 
-std::uint32_t ProcessSettings::currentEnvironment() {
-  std::call_once(_environmentOnce, [this] { _environment = userDefaultsEnvironment(); });
-  return _environment;
-}
-
-std::uint32_t ProcessSettings::userDefaultsEnvironment() {
-  const std::optional<Value> preference =
-      _preferences.value(platform::kVeltraPreferenceDomain, "environmentType");
-  const std::optional<std::uint32_t> stored = preference ? preference->toUInt32() : std::nullopt;
-  std::uint32_t environment = stored.value_or(isInternalBuild() ? kInternalEnvironment : kSeedEnvironment);
-  if (environment >= kEnvironmentCount) {
-    logError("userDefaultsEnvironment: Invalid environment type %u", environment);
-    environment = kInternalEnvironment;
+std::optional<std::uint32_t> ProcessSettings::currentEnvironment() {
+  {
+    const Lock held(_mutex);
+    if (_environment) return _environment;
   }
-  logInfo("userDefaultsEnvironment: Environment type %u", environment);
-  return environment;
+  const std::optional<Environment> found = userDefaultsEnvironment();
+  if (!found) return std::nullopt;
+  {
+    const Lock held(_mutex);
+    if (_environment) return _environment;
+    _environment = found->type;
+  }
+  if (found->refused) logError("userDefaultsEnvironment: Invalid environment type %u", *found->refused);
+  logInfo("userDefaultsEnvironment: Environment type %u", found->type);
+  return found->type;
 }
 
-std::string ProcessSettings::storebagServerURL() {
-  std::call_once(_storebagServerURLOnce, [this] {
-    const auto preference = _preferences.text(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
-    const bool internal = isInternalBuild();
-    _storebagServerURL =
-        preference ? *preference
-                   : "https://" + storebagHost(internal) + (internal ? "/storebags/maple" : "/bags/maple");
-  });
+std::optional<ProcessSettings::Environment> ProcessSettings::userDefaultsEnvironment() {
+  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "environmentType");
+  if (!preference) return std::nullopt;
+  const auto stored = preference.value() ? preference.value()->toUInt32() : std::nullopt;
+  if (stored && *stored >= kEnvironmentCount) return Environment{kInternalEnvironment, stored};
+  if (stored) return Environment{*stored, std::nullopt};
+  const std::optional<bool> internal = _device.internalBuild();
+  if (!internal) return std::nullopt;
+  return Environment{*internal ? kInternalEnvironment : kSeedEnvironment, std::nullopt};
+}
+
+std::optional<std::string> ProcessSettings::storebagServerURL() {
+  {
+    const Lock held(_mutex);
+    if (_storebagServerURL) return _storebagServerURL;
+  }
+  auto found = computeStorebagServerURL();
+  const Lock held(_mutex);
+  if (!_storebagServerURL) _storebagServerURL = std::move(found);
   return _storebagServerURL;
+}
+
+std::optional<std::string> ProcessSettings::computeStorebagServerURL() {
+  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
+  if (!preference) return std::nullopt;
+  if (const auto url = preference.value() ? preference.value()->toText() : std::nullopt) return url;
+  const std::optional<bool> internal = _device.internalBuild();
+  const auto host = internal ? storebagHost(*internal) : std::nullopt;
+  if (!host) return std::nullopt;
+  return "https://" + *host + (*internal ? "/storebags/maple" : "/bags/maple");
 }
 
 bool ProcessSettings::isInternalBuild() {
   return _device.isInternalBuild();
 }
 
-std::string ProcessSettings::storebagHost(bool internalBuild) {
+std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   const char* builtIn = internalBuild ? kInternalStorebagHost : kPublicStorebagHost;
   const char* key = internalBuild ? "internalStorebagHost" : "publicStorebagHost";
   const std::optional<Dictionary> deployment = readDeployment(_files, _deploymentPath);
-  const std::string* host = deployment ? deployment->string(key) : nullptr;
+  if (!deployment) return std::nullopt;
+  const std::string* host = deployment->string(key);
   if (host == nullptr) return builtIn;
   if (!looksLikeHost(*host)) {
     logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s", _deploymentPath.c_str(),

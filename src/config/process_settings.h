@@ -2,9 +2,10 @@
 #pragma once
 
 #include <cstdint>
-#include <mutex>
 #include <optional>
 #include <string>
+
+#include "base/mutex.h"
 
 namespace veltrad {
 
@@ -15,7 +16,8 @@ class Preferences;
 }  // namespace platform
 
 // Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
-// the next start. `main` owns the one object of the process. What the constructor takes must outlive it.
+// the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
+// `main` owns the one object of the process. What the constructor takes must outlive it.
 class ProcessSettings {
  public:
   // `deploymentPath`: a property list with the texts "internalStorebagHost" and "publicStorebagHost", each a
@@ -24,14 +26,20 @@ class ProcessSettings {
                   std::string deploymentPath);
 
   // 0 to 4; 0 names no section of a storebag.
-  std::uint32_t currentEnvironment();
+  std::optional<std::uint32_t> currentEnvironment();
   // No slash at its end, unless the preference has one.
-  std::string storebagServerURL();
+  std::optional<std::string> storebagServerURL();
   bool isInternalBuild();
 
  private:
-  std::uint32_t userDefaultsEnvironment();
-  std::string storebagHost(bool internalBuild);
+  // The type, and the one that was refused for it.
+  struct Environment {
+    std::uint32_t type;
+    std::optional<std::uint32_t> refused;
+  };
+  std::optional<Environment> userDefaultsEnvironment();
+  std::optional<std::string> computeStorebagServerURL();
+  std::optional<std::string> storebagHost(bool internalBuild);
 
   // Constant after construction.
   platform::Preferences& _preferences;
@@ -39,11 +47,9 @@ class ProcessSettings {
   platform::FileStore& _files;
   const std::string _deploymentPath;
 
-  // Written once under the flag beside it, read without a lock afterwards.
-  std::once_flag _environmentOnce;
-  std::uint32_t _environment = 0;
-  std::once_flag _storebagServerURLOnce;
-  std::string _storebagServerURL;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // what was computed first is kept
+  std::optional<std::uint32_t> _environment GUARDED_BY(_mutex);
+  std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad

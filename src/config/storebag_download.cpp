@@ -101,27 +101,46 @@ StorebagDownload::StorebagDownload(platform::HTTPClient& http, ProcessSettings& 
 
 std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::string& name,
                                                                   std::int32_t& maxAge, bool& notModified,
-                                                                  std::optional<std::string>* lastModified) {
-  const std::string url = _settings.storebagServerURL() + "/" + name + "?version=" + _veltra.packageVersion();
+                                                                  std::optional<std::string>* lastModified,
+                                                                  bool& attempted) {
+  const std::optional<std::string> server = _settings.storebagServerURL();
+  const auto version = _veltra.statedVersion();
+  if (!server || !version) {
+    const std::string why = version ? "its address cannot be read just now" : version.error().description;
+    return withoutAnswer(name, "(null)", {platform::HTTPError::Kind::shortage, why}, maxAge, attempted);
+  }
+  const std::string url = *server + "/" + name + "?version=" + version.value();
   logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
   const platform::HTTPResult answer = _http.perform(requestForStorebag(url, lastModified));
-  if (!answer) {
-    logInfo("fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
-            url.c_str(), answer.error().description.c_str());
-    if (name != kNameWithDefault) return std::nullopt;
-    logInfo("fetchStorebagWithName: Loading default storebag '%s'", name.c_str());
-    return defaultStorebag();
-  }
+  if (!answer) return withoutAnswer(name, url, answer.error(), maxAge, attempted);
   const platform::HTTPResponse& response = answer.value();
   maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   if (lastModified != nullptr && isNotModified(response, *lastModified)) {
     notModified = true;
     return std::nullopt;
   }
-  return verifiedStorebag(response.body);
+  return verifiedStorebag(response.body, attempted);
 }
 
-std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view body) const {
+std::optional<Dictionary> StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
+                                                          const platform::HTTPError& error,
+                                                          std::int32_t& maxAge, bool& attempted) const {
+  using Kind = platform::HTTPError::Kind;
+  if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
+    maxAge = kDefaultMaxAgeSeconds;
+    logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
+    logError("fetchStorebagWithName: Signature is missing");
+    return std::nullopt;
+  }
+  attempted = error.kind != Kind::shortage && error.kind != Kind::stopping;
+  logInfo("fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
+          server.c_str(), error.description.c_str());
+  if (name != kNameWithDefault || error.kind == Kind::stopping) return std::nullopt;
+  logInfo("fetchStorebagWithName: Loading default storebag '%s'", name.c_str());
+  return defaultStorebag();
+}
+
+std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view body, bool& attempted) const {
   const auto container = parseStorebagContainer(body);
   if (!container)
     logError("fetchStorebagWithName: propertyListWithData error %s", container.error().detail.c_str());
@@ -129,9 +148,12 @@ std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view bo
     logError("fetchStorebagWithName: Signature is missing");
     return std::nullopt;
   }
-  const std::optional<std::string> der = _veltra.publicKeyDER();
-  if (!der) return std::nullopt;
-  const std::optional<StorebagKey> key = StorebagKey::fromDER(*der);
+  const auto der = _veltra.publicKeyDER();
+  if (!der) {
+    attempted = !der.error().passes();
+    return std::nullopt;
+  }
+  const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
   if (!key) return std::nullopt;
   const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
   if (!decoded) return std::nullopt;

@@ -15,6 +15,7 @@ class ProcessSettings;
 class Veltra;
 namespace platform {
 class HTTPClient;
+struct HTTPError;
 struct HTTPResponse;
 }  // namespace platform
 
@@ -34,13 +35,18 @@ class StorebagDownload {
   // The verified storebag, or nothing. `maxAge` (seconds) is written on every path that got an answer;
   // `notModified` becomes true when the server says that the cached storebag is current; `lastModified` (or
   // null), the "Last-Modified" text of the cached storebag, makes the request conditional and is replaced by
-  // a new one even when the answer then turns out not to verify.
+  // a new one even when the answer then turns out not to verify. `attempted` becomes false where this was no
+  // attempt, of which nothing is to be remembered: for a shortage it could not begin, or its answer not be
+  // verified, or the daemon is stopping.
   std::optional<Dictionary> fetchStorebagWithName(const std::string& name, std::int32_t& maxAge,
-                                                  bool& notModified,
-                                                  std::optional<std::string>* lastModified);
+                                                  bool& notModified, std::optional<std::string>* lastModified,
+                                                  bool& attempted);
 
  private:
-  std::optional<Dictionary> verifiedStorebag(std::string_view body) const;
+  std::optional<Dictionary> withoutAnswer(const std::string& name, const std::string& server,
+                                          const platform::HTTPError& error, std::int32_t& maxAge,
+                                          bool& attempted) const;
+  std::optional<Dictionary> verifiedStorebag(std::string_view body, bool& attempted) const;
 
   platform::HTTPClient& _http;
   ProcessSettings& _settings;

@@ -37,7 +37,7 @@ StorebagSections::StorebagSections(platform::HTTPClient& http, ProcessSettings& 
 
 std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClientType(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-    std::optional<std::string>* lastModified) {
+    std::optional<std::string>* lastModified, bool& attempted) {
   const char* name = storebagNameForClientType(clientType);
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
@@ -45,16 +45,20 @@ std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClient
     return std::nullopt;
   }
   const std::optional<Dictionary> storebag =
-      _download.fetchStorebagWithName(name, maxAge, notModified, lastModified);
+      _download.fetchStorebagWithName(name, maxAge, notModified, lastModified, attempted);
   if (!storebag) {
-    if (!notModified)
+    if (!notModified && attempted)
       logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
                clientType);
     return std::nullopt;
   }
-  const std::uint32_t environment = _settings.currentEnvironment();
-  const char* sectionName = sectionNameForEnvironment(environment);
-  const Dictionary* section = sectionOf(*storebag, environment, sectionName);
+  const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
+  if (!environment) {
+    attempted = false;
+    return std::nullopt;
+  }
+  const char* sectionName = sectionNameForEnvironment(*environment);
+  const Dictionary* section = sectionOf(*storebag, *environment, sectionName);
   if (section == nullptr) {
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "

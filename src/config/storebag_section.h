@@ -17,7 +17,7 @@ class StorebagSections final : public StorebagSource {
 
   std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-      std::optional<std::string>* lastModified) override;
+      std::optional<std::string>* lastModified, bool& attempted) override;
 
  private:
   ProcessSettings& _settings;

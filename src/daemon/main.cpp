@@ -1,13 +1,18 @@
 // veltrad: prepare the process, serve until a signal, stop in order. The main thread runs the loop only.
 #include <unistd.h>
 
+#include <fmt/format.h>
+
 #include <chrono>
 #include <cstdio>
+#include <optional>
+#include <string_view>
 
 #include "daemon/daemon.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
 #include "platform/log.h"
+#include "platform/process_start.h"
 #include "platform/run_loop.h"
 #include "platform/sandbox.h"
 #include "platform/scheduling.h"
@@ -20,12 +25,23 @@ using namespace std::chrono_literals;
 constexpr auto kStopBound = 10s;  // from the signal to the end of the process
 constexpr auto kTick = 1000ms;    // counters are written and the watchdog is fed this often
 
+constexpr const char* kHelp =
+    "Usage: veltrad [--version | --help]\n"
+    "\n"
+    "Serves clients until SIGTERM or SIGINT. Takes its settings from the environment (VELTRA_ROOT, "
+    "VELTRA_LOG,\n"
+    "VELTRA_LOG_TARGET, VELTRA_SANDBOX) and from the files under etc/veltrad.\n"
+    "\n"
+    "  --version  Print the version\n"
+    "  --help     Print this\n";
+
 // What is written to later must be there before the sandbox closes.
 bool makeDirectories(const platform::Root& root) {
   // Not written to, but what an administrator puts there later must be readable then: only what is there now
   // can be let through the sandbox. Where it cannot be made, the file system says that nobody puts anything
   // there.
   static_cast<void>(platform::makeDirectories(root.configurationDirectory()));
+  static_cast<void>(platform::makeDirectories(root.resourcesDirectory()));
   const std::string messageLog = root.messageLogDirectory();
   for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory(), root.logsDirectory(),
                                        messageLog.substr(0, messageLog.rfind('/'))}) {
@@ -35,6 +51,14 @@ bool makeDirectories(const platform::Root& root) {
     }
   }
   return true;
+}
+
+// Where the daemon replaces files. Not before it holds the lock: another daemon's may be under way.
+void removeUnfinishedFiles(const platform::Root& root) {
+  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory()}) {
+    const std::size_t removed = platform::removeUnfinishedFiles(directory);
+    if (removed > 0) logInfo("main: %zu unfinished files removed from %s", removed, directory.c_str());
+  }
 }
 
 void enterSandbox(const platform::Root& root) {
@@ -89,9 +113,31 @@ std::size_t stop(platform::Services& services, Listener& listener) {
   return stuck;
 }
 
+// The status of the process, where the arguments alone decide it.
+std::optional<int> answerArguments(int count, char** arguments) {
+  if (count <= 1) return std::nullopt;
+  const std::string_view argument = arguments[1];
+  if (count == 2 && argument == "--version") {
+    fmt::print("veltrad {}\n", VELTRAD_VERSION);
+    return 0;
+  }
+  if (count == 2 && argument == "--help") {
+    fmt::print("{}", kHelp);
+    return 0;
+  }
+  fmt::print(stderr, "veltrad: unexpected argument \"{}\": expected --version, --help, or none\n",
+             arguments[count == 2 ? 1 : 2]);
+  return 2;
+}
+
 }  // namespace
 
-int main() {
+int main(int count, char** arguments) {
+  platform::openStandardDescriptors();
+  platform::keepEnvironment({"VELTRA_ROOT", "VELTRA_LOG", "VELTRA_LOG_TARGET", "VELTRA_SANDBOX", "LC_ALL",
+                             "LC_MESSAGES", "LANG", "TZ", "NOTIFY_SOCKET", "LISTEN_PID", "LISTEN_FDS",
+                             "LISTEN_FDNAMES", "WATCHDOG_PID", "WATCHDOG_USEC", "JOURNAL_STREAM"});
+  if (const auto status = answerArguments(count, arguments)) return *status;
   platform::takeUtilitySchedulingClass();
   platform::shareHeaps();
   platform::VeltraLogging::startLogging("veltrad", "Daemon");
@@ -105,12 +151,14 @@ int main() {
   enterSandbox(services.root);
   auto socket = openSocket(services);
   if (!socket) return 1;
+  removeUnfinishedFiles(services.root);
 
   Daemon daemon(services);
   Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
                      services.memory, services.root.entitlementsPath()},
                     daemon.agent());
   if (!listener.resume()) return 1;
+  platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
   serve(services, daemon.agent(), loop);
@@ -124,5 +172,6 @@ int main() {
     _exit(0);
   }
   platform::VeltraLogging::stopLogging();
+  platform::allowExit();
   return 0;
 }

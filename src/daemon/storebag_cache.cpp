@@ -20,10 +20,7 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
 std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType,
                                                                        RecursiveMutex& lock) {
   const char* name = storebagNameForClientType(clientType);
-  if (!name) {
-    fetchAndCacheStorebag(clientType, nullptr, lock);
-    return nullptr;
-  }
+  if (!name) return fetchAndCacheStorebag(clientType, nullptr, lock);
   for (;;) {
     const auto at = _cachedStorebags.find(name);
     if (at == _cachedStorebags.end()) break;
@@ -45,8 +42,7 @@ std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int3
     }
     break;
   }
-  fetchAndCacheStorebag(clientType, name, lock);
-  return _cachedStorebags[name].data;
+  return fetchAndCacheStorebag(clientType, name, lock);
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {
@@ -55,24 +51,37 @@ std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clie
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
 }
 
-void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType, const char* name, RecursiveMutex& lock) {
+std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int32_t clientType,
+                                                                       const char* name,
+                                                                       RecursiveMutex& lock) {
   logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
   std::int32_t maxAge = 0;
   std::optional<std::string> version;
   bool notModified = false;
+  bool attempted = true;
   if (!name) {
     std::optional<std::string> lastModified;
-    _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified, &lastModified);
-    return;
+    _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified, &lastModified,
+                                                     attempted);
+    return nullptr;
   }
   std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
   _cachedStorebags[name].beingFetched = true;
   lock.unlock();
   auto section = _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified,
-                                                                  &lastModified);
+                                                                  &lastModified, attempted);
   lock.lock();
 
   StorebagRecord& record = _cachedStorebags[name];
+  record.beingFetched = false;
+  _fetched.notifyAll();
+  if (!attempted) {
+    logInfo(
+        "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
+        clientType);
+    if (record.data || !section) return record.data;
+    return std::make_shared<const Dictionary>(std::move(*section));
+  }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
   record.fetchSuccessful = section.has_value() || notModified;
   if (section) {
@@ -85,8 +94,7 @@ void StorebagCache::fetchAndCacheStorebag(std::int32_t clientType, const char* n
   record.maxAge = maxAge;
   if (lastModified) record.lastModified = std::move(lastModified);
   record.attempted = true;
-  record.beingFetched = false;
-  _fetched.notifyAll();
+  return record.data;
 }
 
 }  // namespace veltrad

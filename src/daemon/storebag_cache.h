@@ -49,7 +49,9 @@ class StorebagCache {
   std::optional<std::string> versionForClientType(std::int32_t clientType) const;
 
  private:
-  void fetchAndCacheStorebag(std::int32_t clientType, const char* name, RecursiveMutex& lock) REQUIRES(lock);
+  // What the session gets.
+  std::shared_ptr<const Dictionary> fetchAndCacheStorebag(std::int32_t clientType, const char* name,
+                                                          RecursiveMutex& lock) REQUIRES(lock);
 
   StorebagSource& _source;
   const platform::Clock& _clock;

@@ -84,7 +84,8 @@ std::optional<std::string> removeStale(const std::string& path) {
   return std::nullopt;
 }
 
-Result<FileDescriptor, std::string> listenAt(const std::string& path) {
+// The socket's own status is of no use: it has an inode of another file system.
+Result<FileDescriptor, std::string> listenAt(const std::string& path, struct stat& made) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   if (path.size() >= sizeof address.sun_path) {
@@ -100,7 +101,8 @@ Result<FileDescriptor, std::string> listenAt(const std::string& path) {
     return Failure{fmt::format("The socket {} cannot be made: {}.", path, reason(errno))};
   }
   // The entitlement decides who may use it, not the file mode.
-  if (::chmod(path.c_str(), 0666) != 0 || ::listen(socket.get(), kWaitingConnections) != 0) {
+  if (::lstat(path.c_str(), &made) != 0 || ::chmod(path.c_str(), 0666) != 0 ||
+      ::listen(socket.get(), kWaitingConnections) != 0) {
     const int error = errno;
     ::unlink(path.c_str());
     return Failure{fmt::format("The socket {} cannot be opened to clients: {}.", path, reason(error))};
@@ -112,7 +114,11 @@ Result<FileDescriptor, std::string> listenAt(const std::string& path) {
 
 void ServiceSocket::close() {
   if (!_listening.isOpen()) return;
-  if (!_madePath.empty()) ::unlink(_madePath.c_str());
+  struct stat found {};
+  if (_made && ::lstat(_made->path.c_str(), &found) == 0 && found.st_dev == _made->device &&
+      found.st_ino == _made->file) {
+    ::unlink(_made->path.c_str());
+  }
   _listening.reset();
 }
 
@@ -124,10 +130,12 @@ Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
   }
   auto lock = takeLock(root.lockPath());
   if (!lock) return Failure{lock.error()};
-  if (handedOver) return ServiceSocket(std::move(given), std::move(lock.value()), {});
-  auto made = listenAt(root.socketPath());
-  if (!made) return Failure{made.error()};
-  return ServiceSocket(std::move(made.value()), std::move(lock.value()), root.socketPath());
+  if (handedOver) return ServiceSocket(std::move(given), std::move(lock.value()), std::nullopt);
+  struct stat made {};
+  auto socket = listenAt(root.socketPath(), made);
+  if (!socket) return Failure{socket.error()};
+  return ServiceSocket(std::move(socket.value()), std::move(lock.value()),
+                       ServiceSocket::Made{root.socketPath(), made.st_dev, made.st_ino});
 }
 
 }  // namespace veltrad::ipc

@@ -2,6 +2,8 @@
 // used by one thread at a time.
 #pragma once
 
+#include <sys/types.h>
+
 #include <optional>
 #include <string>
 
@@ -14,22 +16,28 @@ namespace veltrad::ipc {
 // A listening Unix stream socket. The lock on run/veltrad/lock is held as long as the object lives.
 class ServiceSocket {
  public:
-  // `madePath`: the socket's file, where this process made it; empty for a socket that was handed over.
-  ServiceSocket(platform::FileDescriptor listening, platform::FileDescriptor lock, std::string madePath)
-      : _listening(std::move(listening)), _lock(std::move(lock)), _madePath(std::move(madePath)) {}
+  // The socket's file, where this process made it: as it was then.
+  struct Made {
+    std::string path;
+    dev_t device = 0;
+    ino_t file = 0;
+  };
+  // Without `made`: a socket that was handed over.
+  ServiceSocket(platform::FileDescriptor listening, platform::FileDescriptor lock, std::optional<Made> made)
+      : _listening(std::move(listening)), _lock(std::move(lock)), _made(std::move(made)) {}
   ServiceSocket(ServiceSocket&&) = default;
   ServiceSocket& operator=(ServiceSocket&&) = delete;
   ~ServiceSocket() { close(); }
 
   int listening() const { return _listening.get(); }
-  // Stops listening and removes the socket's file if this process made it; keeps the lock. Twice does
-  // nothing.
+  // Stops listening and removes the socket's file if this process made it and nothing else has taken its
+  // place; keeps the lock. Twice does nothing.
   void close();
 
  private:
   platform::FileDescriptor _listening;
   platform::FileDescriptor _lock;
-  std::string _madePath;
+  std::optional<Made> _made;
 };
 
 // Takes the lock, then uses `handedOver` (socket activation) as it is, or removes a stale socket file and

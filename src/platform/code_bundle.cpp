@@ -8,43 +8,80 @@
 #include <cerrno>
 #include <cstdio>
 #include <filesystem>
-#include <optional>
 #include <system_error>
 #include <utility>
+#include <vector>
+
+#include "platform/process_start.h"
 
 namespace veltrad::platform {
 
 namespace {
 
 constexpr mode_t kWritableByOthers = S_IWGRP | S_IWOTH;
+constexpr int kMostLinks = 40;
 
 std::string loaderText(const std::string& file) {
   const char* text = ::dlerror();
   return text ? text : file + ": cannot be loaded";
 }
 
+// A link's own mode says nothing: who may change it is who may write its directory.
 bool isTrusted(const struct stat& status) {
   const bool ours = status.st_uid == 0 || status.st_uid == ::geteuid();
   const bool sticky = S_ISDIR(status.st_mode) && (status.st_mode & S_ISVTX) != 0;
-  return ours && ((status.st_mode & kWritableByOthers) == 0 || sticky);
+  return ours && ((status.st_mode & kWritableByOthers) == 0 || sticky || S_ISLNK(status.st_mode));
 }
 
-// Nothing, or why somebody else could have put code there. `path` is absolute and free of links.
-std::optional<std::string> distrust(const std::string& path) {
+std::string reasonToDistrust(const std::string& path, const struct stat& status) {
+  char facts[64];
+  std::snprintf(facts, sizeof facts, ": owned by user %u, mode %04o", static_cast<unsigned>(status.st_uid),
+                static_cast<unsigned>(status.st_mode & 07777));
+  return path + facts +
+         "; expected the file and every directory above it to be owned by root or the daemon's own user "
+         "and writable by nobody else";
+}
+
+using Parts = std::vector<std::string>;  // the next one last
+
+void putInFront(Parts& parts, const std::filesystem::path& path) {
+  const Parts names(path.begin(), path.end());
+  parts.insert(parts.end(), names.rbegin(), names.rend());
+}
+
+// The file that an absolute path leads to, once each step of the way was looked at; else why somebody else
+// could have put code there.
+Result<std::string, std::string> trustedFile(const std::filesystem::path& file) {
+  Parts left;
+  putInFront(left, file);
+  std::filesystem::path place = "/";
   struct stat status {};
-  for (std::size_t end = 0; end != std::string::npos;) {
-    end = path.find('/', end + 1);
-    const std::string part = path.substr(0, end);
-    if (::lstat(part.c_str(), &status) != 0) return part + ": " + std::generic_category().message(errno);
-    if (isTrusted(status)) continue;
-    char facts[64];
-    std::snprintf(facts, sizeof facts, ": owned by user %u, mode %04o", static_cast<unsigned>(status.st_uid),
-                  static_cast<unsigned>(status.st_mode & 07777));
-    return part + facts +
-           "; expected the file and every directory above it to be owned by root or the daemon's own user "
-           "and writable by nobody else";
+  for (int links = 0; !left.empty();) {
+    const std::string name = std::move(left.back());
+    left.pop_back();
+    if (name.empty() || name == ".") continue;
+    if (name == "..") {
+      place = place.parent_path();
+      continue;
+    }
+    const std::filesystem::path next = name == "/" ? "/" : place / name;
+    if (::lstat(next.c_str(), &status) != 0) {
+      return Failure{next.string() + ": " + std::generic_category().message(errno)};
+    }
+    if (!isTrusted(status)) return Failure{reasonToDistrust(next, status)};
+    if (!S_ISLNK(status.st_mode)) {
+      place = next;
+      continue;
+    }
+    std::error_code failure;
+    const std::filesystem::path target = std::filesystem::read_symlink(next, failure);
+    if (failure || ++links > kMostLinks) return Failure{next.string() + ": a link that leads nowhere"};
+    putInFront(left, target);
   }
-  return S_ISREG(status.st_mode) ? std::nullopt : std::optional(path + ": not a regular file");
+  if (::lstat(place.c_str(), &status) != 0 || !S_ISREG(status.st_mode)) {
+    return Failure{place.string() + ": not a regular file"};
+  }
+  return place.string();
 }
 
 }  // namespace
@@ -63,11 +100,16 @@ Result<const void*, std::string> CodeBundle::object(const char* symbol) {
 
 Result<void*, std::string> CodeBundle::load() {
   std::error_code failure;
-  const std::string path = std::filesystem::canonical(_file, failure).string();
+  const auto directory = std::filesystem::canonical(_directory, failure);
   if (failure) return Failure{_file + ": " + failure.message()};
-  if (auto reason = distrust(path)) return Failure{std::move(*reason)};
-  void* loaded = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+  const auto path = trustedFile(std::filesystem::absolute(_file));
+  if (!path) return Failure{path.error()};
+  if (!path.value().starts_with(directory.string() + "/")) {
+    return Failure{_file + ": leads to " + path.value() + ", out of the bundle's directory"};
+  }
+  void* loaded = ::dlopen(path.value().c_str(), RTLD_NOW | RTLD_LOCAL);
   if (!loaded) return Failure{loaderText(_file)};
+  renewExitGuard();
   return loaded;
 }
 

@@ -8,13 +8,14 @@
 
 namespace veltrad::platform {
 
-// Only code that nobody but root and the process's own user could have put there is loaded: the file and
-// every directory on the way to it must belong to one of the two and be writable by nobody else (a directory
-// with the sticky bit, /tmp, by others). Links are followed first. What was loaded stays for the life of the
-// process.
+// Only code that nobody but root and the process's own user could have put there is loaded: the file, every
+// link on the way to it, and every directory above either end of a link must belong to one of the two, and
+// files and directories be writable by nobody else (a directory with the sticky bit, /tmp, by others). Links
+// must not lead out of the bundle's directory. What was loaded stays for the life of the process.
 class CodeBundle {
  public:
-  CodeBundle(const std::string& directory, const std::string& name) : _file(directory + "/" + name + ".so") {}
+  CodeBundle(const std::string& directory, const std::string& name)
+      : _directory(directory), _file(directory + "/" + name + ".so") {}
 
   const std::string& file() const { return _file; }
   // The address of an object that the file exports. The error names the file and what is wrong; a file that
@@ -25,6 +26,7 @@ class CodeBundle {
   Result<void*, std::string> load() REQUIRES(_mutex);
 
   // Constant after construction.
+  const std::string _directory;
   const std::string _file;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};

@@ -4,54 +4,88 @@
 #include "base/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
+#include "platform/machine_facts.h"
 
 namespace veltrad::platform {
 
-MachineProperties::MachineProperties(FileStore& files, std::string devicePropertyListPath)
-    : _files(files), _path(std::move(devicePropertyListPath)), _machine(files) {}
+namespace {
 
-std::optional<std::string> MachineProperties::value(std::string_view key) {
-  const Dictionary list = configured();
-  const std::string* text = list.string(key);
+// No machine says "ReleaseType".
+std::optional<std::string> factOf(MachineFacts& machine, std::string_view key) {
+  if (key == "ProductVersion") return machine.productVersion();
+  if (key == "BuildVersion") return machine.buildVersion();
+  if (key == "ProductType") return machine.productType();
+  if (key == "DeviceName") return machine.deviceName();
+  if (key == "HWModelStr") return machine.hardwareModel();
+  if (key == "SerialNumber") return machine.serialNumber();
+  if (key == "UniqueDeviceID") return machine.uniqueDeviceID();
+  return std::nullopt;
+}
+
+}  // namespace
+
+MachineProperties::MachineProperties(FileStore& files, std::string devicePropertyListPath)
+    : _files(files), _path(std::move(devicePropertyListPath)) {}
+
+DeviceProperty MachineProperties::value(std::string_view key) {
+  const auto list = configured();
+  // The machine is not asked instead: it may say something else.
+  if (!list) return Failure{list.error()};
+  const std::string* text = list.value().string(key);
   if (!text) return fromMachine(key);
   return text->empty() ? std::nullopt : std::optional(*text);
 }
 
-Dictionary MachineProperties::configured() {
+Result<Dictionary, FileFailure> MachineProperties::configured() {
+  auto list = readList();
+  const Lock lock(_mutex);
+  if (list) _lastList = list.value();
+  if (!list && _lastList) return *_lastList;
+  return list;
+}
+
+Result<Dictionary, FileFailure> MachineProperties::readList() {
   const auto bytes = _files.read(_path);
   if (!bytes) {
+    if (bytes.error().passes()) return Failure{bytes.error()};
     if (bytes.error().kind != FileFailure::Kind::notFound) complainOnce(bytes.error().description);
-    return {};
+    return Dictionary();
   }
   const auto list = parsePropertyList(bytes.value());
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
   if (dictionary) return *dictionary;
   complainOnce(_path + ": " +
                (list ? "the outermost value is not a dictionary of texts" : list.error().detail));
-  return {};
+  return Dictionary();
 }
 
 void MachineProperties::complainOnce(const std::string& why) {
   const auto stamp = _files.stamp(_path);
+  if (!stamp) return;  // the next question says it
   {
     Lock lock(_mutex);
-    if (_hasComplained && _complained == stamp) return;
+    if (_hasComplained && _complained == stamp.value()) return;
     _hasComplained = true;
-    _complained = stamp;
+    _complained = stamp.value();
   }
   logError("Device properties could not be read, the machine is asked: %s", why.c_str());
 }
 
-// No machine says "ReleaseType".
-std::optional<std::string> MachineProperties::fromMachine(std::string_view key) const {
-  if (key == "ProductVersion") return _machine.productVersion();
-  if (key == "BuildVersion") return _machine.buildVersion();
-  if (key == "ProductType") return _machine.productType();
-  if (key == "DeviceName") return _machine.deviceName();
-  if (key == "HWModelStr") return _machine.hardwareModel();
-  if (key == "SerialNumber") return _machine.serialNumber();
-  if (key == "UniqueDeviceID") return _machine.uniqueDeviceID();
-  return std::nullopt;
+DeviceProperty MachineProperties::fromMachine(std::string_view key) {
+  MachineFacts machine(_files);
+  auto fact = factOf(machine, key);
+  const Lock lock(_mutex);
+  const auto last = _lastFacts.find(key);
+  if (machine.shortage()) {
+    if (last == _lastFacts.end()) return Failure{*machine.shortage()};
+    return last->second;
+  }
+  if (last != _lastFacts.end()) {
+    last->second = fact;
+  } else if (fact) {
+    _lastFacts.emplace(key, fact);
+  }
+  return fact;
 }
 
 }  // namespace veltrad::platform

@@ -56,6 +56,7 @@ std::optional<std::string> problemOf(const Value& value) {
 
 struct ReadRules {
   Array rules;
+  std::optional<std::string> shortage;
   std::optional<std::string> error;
   std::vector<std::string> warnings;
 };
@@ -64,7 +65,12 @@ ReadRules readRules(FileStore& files, const std::string& path) {
   ReadRules read;
   const auto bytes = files.read(path);
   if (!bytes) {
-    if (bytes.error().kind != FileFailure::Kind::notFound) read.error = bytes.error().description;
+    const FileFailure& failure = bytes.error();
+    if (failure.passes()) {
+      read.shortage = failure.description;
+    } else if (failure.kind != FileFailure::Kind::notFound) {
+      read.error = failure.description;
+    }
     return read;
   }
   const auto list = parsePropertyList(bytes.value());
@@ -104,26 +110,46 @@ std::optional<Value> entitlementInRules(const Array& rules, std::string_view nam
 
 Entitlements::Entitlements(FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
 
-std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {
+// Logged once the lock is released.
+struct Entitlements::Said {
   std::optional<std::string> error;
+  std::optional<std::string> shortage;
   std::vector<std::string> warnings;
+};
+
+void Entitlements::refresh(Said& said) {
+  // The stamp comes first: a file that changes while it is read is read again.
+  const auto stamp = _files.stamp(_path);
+  if (!stamp) {
+    said.shortage = stamp.error().description;
+    return;
+  }
+  if (_read && stamp.value() == _stamp) return;
+  ReadRules fresh = readRules(_files, _path);
+  said.shortage = std::move(fresh.shortage);
+  if (said.shortage) return;
+  _rules = std::move(fresh.rules);
+  said.error = std::move(fresh.error);
+  said.warnings = std::move(fresh.warnings);
+  _stamp = stamp.value();
+  _read = true;
+}
+
+std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {
+  Said said;
   std::optional<Value> found;
   {
     Lock lock(_mutex);
-    // The stamp comes first: a file that changes while it is read is read again.
-    const auto stamp = _files.stamp(_path);
-    if (!_read || stamp != _stamp) {
-      ReadRules fresh = readRules(_files, _path);
-      _rules = std::move(fresh.rules);
-      error = std::move(fresh.error);
-      warnings = std::move(fresh.warnings);
-      _stamp = stamp;
-      _read = true;
-    }
+    refresh(said);
     found = entitlementInRules(_rules, name, peer);
   }
-  if (error) logError("Entitlements could not be read, nothing is granted: %s", error->c_str());
-  for (const std::string& warning : warnings) logWarning("Entitlements: %s", warning.c_str());
+  if (said.error) logError("Entitlements could not be read, nothing is granted: %s", said.error->c_str());
+  for (const std::string& warning : said.warnings) logWarning("Entitlements: %s", warning.c_str());
+  if (said.shortage) {
+    const auto line = _shortages.happened("Entitlements could not be read just now, the last rules stand: " +
+                                          *said.shortage);
+    if (line) logWarning("%s", line->c_str());
+  }
   return found;
 }
 

@@ -8,6 +8,7 @@
 
 #include "base/mutex.h"
 #include "base/value.h"
+#include "platform/limited_line.h"
 #include "platform/peer.h"
 
 namespace veltrad::platform {
@@ -16,7 +17,8 @@ class FileStore;
 
 // The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
 // rule with more than one of the three matches when all of them match, one with none never. A missing or
-// unreadable file grants nothing; an unreadable or malformed one is one error line a change.
+// unreadable file grants nothing; an unreadable or malformed one is one error line a change. For a shortage
+// the last rules stand, and the file is read again at the next question.
 class Entitlements {
  public:
   Entitlements(FileStore& files, std::string path);
@@ -24,12 +26,16 @@ class Entitlements {
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
 
  private:
+  struct Said;
+  void refresh(Said& said) REQUIRES(_mutex);
+
   FileStore& _files;
   const std::string _path;
   Mutex _mutex{LockRank::leaf};
   std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
   bool _read GUARDED_BY(_mutex) = false;
   Array _rules GUARDED_BY(_mutex);
+  LimitedLine _shortages{"questions"};
 };
 
 // The decision alone; exposed for its table of tests.

@@ -8,9 +8,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <filesystem>
 #include <system_error>
 
 #include "platform/file_descriptor.h"
+#include "platform/shortage.h"
 #include "platform/uuid.h"
 
 namespace veltrad::platform {
@@ -24,6 +26,7 @@ FileFailure failureOf(const std::string& path, int error) {
   if (error == EACCES || error == EPERM) kind = Kind::noAccess;
   if (error == ENOSPC || error == EDQUOT) kind = Kind::noSpace;
   if (error == EFBIG) kind = Kind::tooLarge;
+  if (isShortage(error)) kind = Kind::shortage;
   return {kind, path + ": " + std::generic_category().message(error)};
 }
 
@@ -73,6 +76,16 @@ std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
     number >>= 8;
   }
   return hash;
+}
+
+// NAME.XXXXXXXX.new, as replace() makes them.
+bool isUnfinishedName(std::string_view name) {
+  constexpr std::size_t kDigits = 8;
+  constexpr std::string_view kEnd = ".new";
+  constexpr std::size_t kTail = 1 + kDigits + kEnd.size();
+  if (name.size() <= kTail || !name.ends_with(kEnd)) return false;
+  const std::string_view tail = name.substr(name.size() - kTail, 1 + kDigits);
+  return tail[0] == '.' && tail.find_first_not_of("0123456789abcdefABCDEF", 1) == std::string_view::npos;
 }
 
 }  // namespace
@@ -125,9 +138,12 @@ std::optional<FileFailure> DiskFileStore::rename(const std::string& from, const 
   return std::nullopt;
 }
 
-std::optional<std::uint64_t> DiskFileStore::stamp(const std::string& path) {
+Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   struct stat status {};
-  if (::stat(path.c_str(), &status) != 0) return std::nullopt;
+  if (::stat(path.c_str(), &status) != 0) {
+    if (isShortage(errno)) return Failure{failureOf(path, errno)};
+    return FileStamp();
+  }
   std::uint64_t hash = 0xcbf29ce484222325u;
   for (const auto part :
        {static_cast<std::uint64_t>(status.st_dev), static_cast<std::uint64_t>(status.st_ino),
@@ -136,7 +152,7 @@ std::optional<std::uint64_t> DiskFileStore::stamp(const std::string& path) {
         static_cast<std::uint64_t>(status.st_ctim.tv_nsec)}) {
     hash = mixed(hash, part);
   }
-  return hash;
+  return FileStamp(hash);
 }
 
 std::optional<FileFailure> makeDirectories(const std::string& path) {
@@ -154,6 +170,19 @@ std::optional<FileFailure> makeDirectories(const std::string& path) {
   if (::stat(path.c_str(), &status) != 0) return failureOf(path, errno);
   if (!S_ISDIR(status.st_mode)) return failureOf(path, ENOTDIR);
   return std::nullopt;
+}
+
+std::size_t removeUnfinishedFiles(const std::string& directory) {
+  std::size_t removed = 0;
+  std::error_code failure;
+  for (std::filesystem::directory_iterator at(directory, failure), end; !failure && at != end;
+       at.increment(failure)) {
+    struct stat status {};
+    const std::string path = at->path().string();
+    if (!isUnfinishedName(at->path().filename().string()) || ::lstat(path.c_str(), &status) != 0) continue;
+    if (S_ISREG(status.st_mode) && ::unlink(path.c_str()) == 0) ++removed;
+  }
+  return removed;
 }
 
 }  // namespace veltrad::platform

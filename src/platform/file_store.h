@@ -11,10 +11,15 @@
 namespace veltrad::platform {
 
 struct FileFailure {
-  enum class Kind { notFound, noAccess, tooLarge, noSpace, other };
+  // shortage: no descriptor or memory, or an I/O error, just now. It says nothing about the file, so nobody
+  // remembers it as an answer.
+  enum class Kind { notFound, noAccess, tooLarge, noSpace, other, shortage };
   Kind kind;
+  bool passes() const { return kind == Kind::shortage; }
   std::string description;  // names the path: "/etc/veltrad/x.plist: Permission denied"
 };
+
+using FileStamp = std::optional<std::uint64_t>;
 
 class FileStore {
  public:
@@ -27,8 +32,9 @@ class FileStore {
                                              unsigned mode = 0600) = 0;
   // Renames within one directory.
   virtual std::optional<FileFailure> rename(const std::string& from, const std::string& to) = 0;
-  // Changes when the file is written or replaced; absent while there is no such file.
-  virtual std::optional<std::uint64_t> stamp(const std::string& path) = 0;
+  // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
+  // alone.
+  virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
 };
 
 class DiskFileStore final : public FileStore {
@@ -36,10 +42,14 @@ class DiskFileStore final : public FileStore {
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
   std::optional<FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
   std::optional<FileFailure> rename(const std::string& from, const std::string& to) override;
-  std::optional<std::uint64_t> stamp(const std::string& path) override;
+  Result<FileStamp, FileFailure> stamp(const std::string& path) override;
 };
 
 // Makes the directory and its parents (mode 0755) where they are missing.
 std::optional<FileFailure> makeDirectories(const std::string& path);
+
+// Removes what a replace() that was killed has left in the directory: regular files under its pattern of
+// names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.
+std::size_t removeUnfinishedFiles(const std::string& directory);
 
 }  // namespace veltrad::platform

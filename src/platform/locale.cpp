@@ -50,8 +50,13 @@ std::optional<std::string> EnvironmentLocale::countryCode() {
     if (name && *name) return countryOfLocaleName(name);
   }
   const auto configuration = _files.read(_path, 64u << 10);
-  if (!configuration) return std::nullopt;
-  const auto name = valueInEnvironmentFile(configuration.value(), "LANG");
+  const Lock lock(_mutex);
+  if (configuration) {
+    _last = valueInEnvironmentFile(configuration.value(), "LANG");
+  } else if (!configuration.error().passes()) {
+    _last.reset();
+  }
+  const auto& name = _last;
   return name ? countryOfLocaleName(*name) : std::nullopt;
 }
 

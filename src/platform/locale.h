@@ -4,6 +4,8 @@
 #include <optional>
 #include <string>
 
+#include "base/mutex.h"
+
 namespace veltrad::platform {
 
 class FileStore;
@@ -17,7 +19,8 @@ class Locale {
   virtual int timeZoneOffset() = 0;
 };
 
-// The first that is set and not empty of LC_ALL, LC_MESSAGES, LANG, then "LANG" in the locale.conf given.
+// The first that is set and not empty of LC_ALL, LC_MESSAGES, LANG, then "LANG" in the locale.conf given,
+// which is as it last was while it cannot be read for a shortage.
 class EnvironmentLocale final : public Locale {
  public:
   EnvironmentLocale(FileStore& files, std::string localeConfigurationPath);
@@ -27,6 +30,8 @@ class EnvironmentLocale final : public Locale {
  private:
   FileStore& _files;
   const std::string _path;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::optional<std::string> _last GUARDED_BY(_mutex);
 };
 
 // The country part of a locale name; exposed for its table of tests.

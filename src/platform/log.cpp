@@ -11,6 +11,7 @@
 #include <systemd/sd-journal.h>
 
 #include <cerrno>
+#include <climits>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
@@ -30,6 +31,8 @@ std::atomic<int> threshold{static_cast<int>(LogLevel::info)};
 namespace {
 
 constexpr int kUserFacility = LOG_USER;
+constexpr std::size_t kMostJournalBytes = 48u << 10;  // what the journal takes of a line by default
+constexpr std::size_t kMostSyslogBytes = 4u << 10;
 
 struct Target {
   enum class Kind { standardError, terminal, journal, syslog };
@@ -65,6 +68,14 @@ const char* nameOf(LogLevel level) {
   return "unknown";
 }
 
+// The beginning of an escaped line, and how much of it is missing, in `most` bytes.
+std::string cut(std::string_view line, std::size_t most) {
+  if (line.size() <= most) return std::string(line);
+  constexpr std::size_t kLongestNote = 40;
+  const std::string_view kept = withoutIncompleteEnd(line.substr(0, most - kLongestNote));
+  return std::string(kept) + "… (" + std::to_string(line.size() - kept.size()) + " bytes cut)";
+}
+
 std::string localTime() {
   timespec now{};
   ::clock_gettime(CLOCK_REALTIME, &now);
@@ -76,22 +87,21 @@ std::string localTime() {
   return text;
 }
 
-void writeToStandardError(const std::string& text) {
-  const char* next = text.data();
-  std::size_t left = text.size();
-  while (left > 0) {
-    const ssize_t written = ::write(STDERR_FILENO, next, left);
-    if (written < 0 && errno == EINTR) continue;
-    if (written <= 0) return;  // there is nobody left to tell
-    next += written;
-    left -= static_cast<std::size_t>(written);
+// At most PIPE_BUF bytes in one write, so that a pipe holds the line whole or not at all, whoever else
+// writes.
+void writeToStandardError(const std::string& before, std::string_view line) {
+  std::string text = before;
+  text += cut(line, PIPE_BUF - before.size() - 1);
+  text += '\n';
+  // Where it fails there is nobody left to tell.
+  while (::write(STDERR_FILENO, text.data(), text.size()) < 0 && errno == EINTR) {
   }
 }
 
 void writeToJournal(const Target& target, LogLevel level, const std::string& line) {
-  const std::string fields[] = {"MESSAGE=" + line, "PRIORITY=" + std::to_string(static_cast<int>(level)),
-                                "SYSLOG_IDENTIFIER=" + target.program,
-                                "SYSLOG_FACILITY=" + std::to_string(target.facility >> 3)};
+  const std::string fields[] = {
+      "MESSAGE=" + cut(line, kMostJournalBytes), "PRIORITY=" + std::to_string(static_cast<int>(level)),
+      "SYSLOG_IDENTIFIER=" + target.program, "SYSLOG_FACILITY=" + std::to_string(target.facility >> 3)};
   iovec vectors[std::size(fields)];
   for (std::size_t i = 0; i < std::size(fields); ++i) {
     vectors[i] = {const_cast<char*>(fields[i].data()), fields[i].size()};
@@ -102,13 +112,13 @@ void writeToJournal(const Target& target, LogLevel level, const std::string& lin
 void writeTo(const Target& target, LogLevel level, const std::string& line) {
   switch (target.kind) {
     case Target::Kind::standardError:
-      return writeToStandardError("<" + std::to_string(static_cast<int>(level)) + ">" + line + "\n");
+      return writeToStandardError("<" + std::to_string(static_cast<int>(level)) + ">", line);
     case Target::Kind::terminal:
-      return writeToStandardError(localTime() + " " + nameOf(level) + ": " + line + "\n");
+      return writeToStandardError(localTime() + " " + nameOf(level) + ": ", line);
     case Target::Kind::journal:
       return writeToJournal(target, level, line);
     case Target::Kind::syslog:
-      return ::syslog(target.facility | static_cast<int>(level), "%s", line.c_str());
+      return ::syslog(target.facility | static_cast<int>(level), "%s", cut(line, kMostSyslogBytes).c_str());
   }
 }
 

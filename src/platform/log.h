@@ -4,7 +4,8 @@
 //
 // The format is printf's, checked by the compiler, and stands in the code exactly as the user sees it. Below
 // the threshold a line costs one comparison and its arguments are not evaluated. A line is escaped as a whole
-// (base/text.h); one line break at its end is dropped.
+// (base/text.h); one line break at its end is dropped. One that is longer than its target takes (PIPE_BUF on
+// standard error, 48 KiB in the journal) is cut, and says by how much.
 #pragma once
 
 #include <atomic>

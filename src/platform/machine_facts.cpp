@@ -72,9 +72,12 @@ std::optional<std::string> deviceNameOfChassisType(int type) {
   }
 }
 
-std::optional<std::string> MachineFacts::contents(const char* path) const {
+std::optional<std::string> MachineFacts::contents(const char* path) {
   const auto bytes = _files.read(path, kMostBytes);
-  if (!bytes) return std::nullopt;
+  if (!bytes) {
+    if (bytes.error().passes() && !_shortage) _shortage = bytes.error();
+    return std::nullopt;
+  }
   static constexpr std::string_view kBlanks(" \t\r\n\0", 5);
   const std::string& text = bytes.value();
   const auto begin = text.find_first_not_of(kBlanks);
@@ -82,36 +85,36 @@ std::optional<std::string> MachineFacts::contents(const char* path) const {
   return toUTF8(std::string_view(text).substr(begin, text.find_last_not_of(kBlanks) - begin + 1));
 }
 
-std::optional<std::string> MachineFacts::fromOSRelease(const char* name) const {
+std::optional<std::string> MachineFacts::fromOSRelease(const char* name) {
   for (const char* path : {"/etc/os-release", "/usr/lib/os-release"}) {
     if (const auto text = contents(path)) return valueInEnvironmentFile(*text, name);
   }
   return std::nullopt;
 }
 
-std::optional<std::string> MachineFacts::productVersion() const {
+std::optional<std::string> MachineFacts::productVersion() {
   return fromOSRelease("VERSION_ID");
 }
 
-std::optional<std::string> MachineFacts::buildVersion() const {
+std::optional<std::string> MachineFacts::buildVersion() {
   if (auto build = fromOSRelease("BUILD_ID")) return build;
   return contents("/proc/sys/kernel/osrelease");
 }
 
-std::optional<std::string> MachineFacts::productType() const {
+std::optional<std::string> MachineFacts::productType() {
   if (auto name = contents("/sys/class/dmi/id/product_name")) return name;
   return contents("/proc/device-tree/model");
 }
 
-std::optional<std::string> MachineFacts::hardwareModel() const {
+std::optional<std::string> MachineFacts::hardwareModel() {
   return contents("/sys/class/dmi/id/board_name");
 }
 
-std::optional<std::string> MachineFacts::serialNumber() const {
+std::optional<std::string> MachineFacts::serialNumber() {
   return contents("/sys/class/dmi/id/product_serial");
 }
 
-std::optional<std::string> MachineFacts::uniqueDeviceID() const {
+std::optional<std::string> MachineFacts::uniqueDeviceID() {
   const auto machineID = contents("/etc/machine-id");
   if (!machineID || !isMachineID(*machineID)) return std::nullopt;
   const std::string salted = std::string(kDeviceIDSalt) + *machineID;
@@ -127,13 +130,18 @@ std::optional<std::string> MachineFacts::uniqueDeviceID() const {
   return text;
 }
 
-// Existence is asked alone: the sandbox lets nobody open these.
-bool MachineFacts::isContainer() const {
-  return _files.stamp("/run/systemd/container") || _files.stamp("/run/.containerenv") ||
-         _files.stamp("/.dockerenv");
+// Existence is asked alone: the sandbox lets nobody open what this is asked of.
+bool MachineFacts::exists(const char* path) {
+  const auto stamp = _files.stamp(path);
+  if (!stamp && !_shortage) _shortage = stamp.error();
+  return stamp && stamp.value();
 }
 
-bool MachineFacts::isVirtualMachine() const {
+bool MachineFacts::isContainer() {
+  return exists("/run/systemd/container") || exists("/run/.containerenv") || exists("/.dockerenv");
+}
+
+bool MachineFacts::isVirtualMachine() {
   for (const char* path : {"/sys/class/dmi/id/sys_vendor", "/sys/class/dmi/id/product_name"}) {
     const auto text = contents(path);
     if (!text) continue;
@@ -150,7 +158,7 @@ bool MachineFacts::isVirtualMachine() const {
   return line.find(" hypervisor ") != std::string::npos;
 }
 
-std::string MachineFacts::deviceName() const {
+std::string MachineFacts::deviceName() {
   if (const auto information = contents("/etc/machine-info")) {
     const auto chassis = valueInEnvironmentFile(*information, "CHASSIS");
     if (const auto name = chassis ? deviceNameOfChassis(*chassis) : std::nullopt) return *name;
@@ -162,7 +170,7 @@ std::string MachineFacts::deviceName() const {
     std::from_chars(text->data(), text->data() + text->size(), type);
     if (const auto name = deviceNameOfChassisType(type)) return *name;
   }
-  return _files.stamp("/proc/device-tree/model") ? "Embedded" : "Computer";
+  return exists("/proc/device-tree/model") ? "Embedded" : "Computer";
 }
 
 }  // namespace veltrad::platform

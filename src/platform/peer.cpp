@@ -11,6 +11,7 @@
 #include <system_error>
 
 #include "platform/file_descriptor.h"
+#include "platform/shortage.h"
 
 namespace veltrad::platform {
 
@@ -20,15 +21,25 @@ namespace {
 constexpr int SO_PEERPIDFD = 77;  // Linux 6.5
 #endif
 
-std::optional<std::string> contents(const std::string& path) {
+// What could not be asked for a shortage: errno, else 0. The peer's unit is not known then, which is not
+// none.
+struct Asked {
+  int shortage = 0;
+  bool failed(int error) {
+    if (isShortage(error)) shortage = error;
+    return true;
+  }
+};
+
+std::optional<std::string> contents(const std::string& path, Asked& asked) {
   const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file.isOpen()) return std::nullopt;
+  if (!file.isOpen() && asked.failed(errno)) return std::nullopt;
   std::string text;
   char buffer[4'096];
   while (text.size() < 64u << 10) {
     const ssize_t got = ::read(file.get(), buffer, sizeof buffer);
     if (got < 0 && errno == EINTR) continue;
-    if (got < 0) return std::nullopt;
+    if (got < 0 && asked.failed(errno)) return std::nullopt;
     if (got == 0) return text;
     text.append(buffer, static_cast<std::size_t>(got));
   }
@@ -47,29 +58,29 @@ std::optional<std::string> lineAfter(std::string_view text, std::string_view pre
 }
 
 // The process that a pidfd names; 0 when it is dead (-1) or in another process namespace (0).
-int processOfPidfd(int pidfd) {
-  const auto information = contents("/proc/self/fdinfo/" + std::to_string(pidfd));
+int processOfPidfd(int pidfd, Asked& asked) {
+  const auto information = contents("/proc/self/fdinfo/" + std::to_string(pidfd), asked);
   const auto text = information ? lineAfter(*information, "Pid:\t") : std::nullopt;
   int pid = 0;
   if (text) std::from_chars(text->data(), text->data() + text->size(), pid);
   return pid > 0 ? pid : 0;
 }
 
-FileDescriptor pidfdOfPeer(int socket) {
+FileDescriptor pidfdOfPeer(int socket, Asked& asked) {
   int pidfd = -1;
   socklen_t length = sizeof pidfd;
-  if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &pidfd, &length) != 0) return {};
+  if (::getsockopt(socket, SOL_SOCKET, SO_PEERPIDFD, &pidfd, &length) != 0 && asked.failed(errno)) return {};
   return FileDescriptor(pidfd);
 }
 
-std::optional<std::string> unitOfPeer(int socket) {
-  const FileDescriptor pidfd = pidfdOfPeer(socket);
+std::optional<std::string> unitOfPeer(int socket, Asked& asked) {
+  const FileDescriptor pidfd = pidfdOfPeer(socket, asked);
   if (!pidfd.isOpen()) return std::nullopt;
-  const int pid = processOfPidfd(pidfd.get());
+  const int pid = processOfPidfd(pidfd.get(), asked);
   if (pid == 0) return std::nullopt;
-  const auto groups = contents("/proc/" + std::to_string(pid) + "/cgroup");
+  const auto groups = contents("/proc/" + std::to_string(pid) + "/cgroup", asked);
   // A process that is alive now was so when its groups were read: the number was not another's in between.
-  if (!groups || processOfPidfd(pidfd.get()) != pid) return std::nullopt;
+  if (!groups || processOfPidfd(pidfd.get(), asked) != pid) return std::nullopt;
   auto path = lineAfter(*groups, "0::");
   for (std::string_view left = *groups; !path && !left.empty();) {  // cgroup v1: "N:name=systemd:/path"
     const auto end = left.find('\n');
@@ -116,16 +127,20 @@ Result<Peer, std::string> peerOfSocket(int socket) {
   peer.gids.push_back(credentials.gid);
   peer.gids.insert(peer.gids.end(), groups.value().begin(), groups.value().end());
   peer.pid = credentials.pid;
-  peer.unit = unitOfPeer(socket);
+  Asked asked;
+  peer.unit = unitOfPeer(socket, asked);
+  if (asked.shortage != 0)
+    return Failure{"the peer's unit: " + std::generic_category().message(asked.shortage)};
   return peer;
 }
 
 bool kernelTellsUnits() {
   int ends[2];
-  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return false;
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return isShortage(errno);
   const FileDescriptor one(ends[0]);
   const FileDescriptor other(ends[1]);
-  return pidfdOfPeer(one.get()).isOpen();
+  Asked asked;
+  return pidfdOfPeer(one.get(), asked).isOpen() || asked.shortage != 0;
 }
 
 // Slices nest above the unit; what lies below the first unit is the unit's own to name, so it says nothing.

@@ -18,8 +18,9 @@ struct Peer {
   std::optional<std::string> unit;
 };
 
+// Fails also where the unit cannot be asked for just now, for want of a descriptor.
 Result<Peer, std::string> peerOfSocket(int socket);
-// False on kernels that cannot say which unit a peer belongs to.
+// False only on kernels that cannot say which unit a peer belongs to.
 bool kernelTellsUnits();
 // The unit in a control group path ("/system.slice/x.service"); exposed for its table of tests.
 std::optional<std::string> systemUnitOfControlGroup(const std::string& path);

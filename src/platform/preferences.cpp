@@ -21,6 +21,11 @@ std::string nameOf(std::string_view domain, std::string_view key) {
 
 }  // namespace
 
+std::optional<Value> Preferences::value(std::string_view domain, std::string_view key) {
+  auto found = lookUp(domain, key);
+  return found ? std::move(found).value() : std::nullopt;
+}
+
 std::optional<std::string> Preferences::text(std::string_view domain, std::string_view key) {
   const auto found = value(domain, key);
   return found ? found->toText() : std::nullopt;
@@ -29,15 +34,19 @@ std::optional<std::string> Preferences::text(std::string_view domain, std::strin
 FilePreferences::FilePreferences(FileStore& files, std::string directory)
     : _files(files), _directory(std::move(directory)) {}
 
-std::optional<Value> FilePreferences::value(std::string_view domain, std::string_view key) {
+Preferences::Found FilePreferences::lookUp(std::string_view domain, std::string_view key) {
   Complaints complaints;
-  std::optional<Value> found;
+  Found found = std::optional<Value>();
   {
     Lock lock(_mutex);
-    const auto all = read(domain, complaints);
-    const Value* stored = all ? all->find(key) : nullptr;
-    if (!stored) stored = _unstored.find(nameOf(domain, key));
-    if (stored) found = *stored;
+    const auto all = known(domain, complaints);
+    const Value* value = all ? all.value().find(key) : nullptr;
+    if (!value) value = _unstored.find(nameOf(domain, key));
+    if (value) {
+      found = std::optional(*value);
+    } else if (!all) {
+      found = Failure{all.error()};
+    }
   }
   logAll(complaints);
   return found;
@@ -54,21 +63,28 @@ bool FilePreferences::setValue(std::string_view domain, std::string_view key, co
   return stored;
 }
 
-std::string FilePreferences::textOrStore(std::string_view domain, std::string_view key,
-                                         std::string (*make)()) {
+std::optional<std::string> FilePreferences::textOrStore(std::string_view domain, std::string_view key,
+                                                        std::string (*make)()) {
   Complaints complaints;
-  std::string text;
+  std::optional<std::string> text;
   {
     Lock lock(_mutex);
-    const auto all = read(domain, complaints);
-    const Value* found = all ? all->find(key) : nullptr;
-    if (const auto stored = found ? found->toText() : std::nullopt) text = *stored;
-    if (text.empty()) {
-      if (const std::string* unstored = _unstored.string(nameOf(domain, key))) text = *unstored;
-    }
-    if (text.empty()) {
-      text = make();
-      if (!store(domain, key, text, complaints)) _unstored.set(nameOf(domain, key), text);
+    const auto all = known(domain, complaints);
+    const Value* found = all ? all.value().find(key) : nullptr;
+    text = found ? found->toText() : std::nullopt;
+    if (!text || text->empty()) {
+      const std::string name = nameOf(domain, key);
+      const std::string* unstored = _unstored.string(name);
+      Complaints said;  // once, when it was made
+      if (unstored) {
+        text = *unstored;
+        if (store(domain, key, *text, said)) _unstored.erase(name);
+      } else if (all) {
+        text = make();
+        if (!store(domain, key, *text, complaints)) _unstored.set(name, *text);
+      } else {
+        text = std::nullopt;
+      }
     }
   }
   logAll(complaints);
@@ -79,34 +95,54 @@ std::string FilePreferences::pathOf(std::string_view domain) const {
   return _directory + "/" + std::string(domain) + ".plist";
 }
 
-std::optional<Dictionary> FilePreferences::read(std::string_view domain, Complaints& complaints) {
+Result<Dictionary, FileFailure> FilePreferences::known(std::string_view domain, Complaints& complaints) {
+  const std::string path = pathOf(domain);
+  const auto stamp = _files.stamp(path);  // first: a file that changes while it is read is not known
+  auto all = read(domain, complaints);
+  if (all) {
+    if (stamp) {
+      _lastRead[path] = {stamp.value(), all.value()};
+    } else {
+      _lastRead.erase(path);
+    }
+    return all;
+  }
+  if (!all.error().passes()) return Dictionary();
+  const auto last = _lastRead.find(path);
+  if (last != _lastRead.end() && stamp && stamp.value() == last->second.stamp) return last->second.all;
+  return all;
+}
+
+Result<Dictionary, FileFailure> FilePreferences::read(std::string_view domain, Complaints& complaints) {
   const std::string path = pathOf(domain);
   const auto bytes = _files.read(path);
   if (!bytes) {
     const FileFailure& failure = bytes.error();
     if (failure.kind == FileFailure::Kind::notFound) return Dictionary();
+    if (failure.passes()) return Failure{failure};
     const bool ofTheFile =
         failure.kind == FileFailure::Kind::noAccess || failure.kind == FileFailure::Kind::tooLarge;
-    return refused(path, failure.description, ofTheFile, complaints);
+    return refused(path, failure, ofTheFile, complaints);
   }
   const auto list = parsePropertyList(bytes.value());
-  if (!list) return refused(path, path + ": " + list.error().detail, true, complaints);
-  const Dictionary* all = list.value().asDictionary();
-  if (!all) return refused(path, path + ": the outermost value is not a dictionary", true, complaints);
-  return *all;
+  const Dictionary* all = list ? list.value().asDictionary() : nullptr;
+  if (all) return *all;
+  const std::string why = list ? "the outermost value is not a dictionary" : list.error().detail;
+  return refused(path, {FileFailure::Kind::other, path + ": " + why}, true, complaints);
 }
 
 // What serves instead of the file: an empty domain once it was put aside, else nothing.
-std::optional<Dictionary> FilePreferences::refused(const std::string& path, const std::string& why,
-                                                   bool putAside, Complaints& complaints) {
+Result<Dictionary, FileFailure> FilePreferences::refused(const std::string& path, FileFailure why,
+                                                         bool putAside, Complaints& complaints) {
   const auto stamp = _files.stamp(path);
-  const bool said = _complained.contains(path) && _complained[path] == stamp;
+  if (!stamp) return Failure{stamp.error()};
+  const bool said = _complained.contains(path) && _complained[path] == stamp.value();
   const auto failure = putAside ? _files.rename(path, path + ".corrupt") : std::nullopt;
-  std::string line = "Preferences could not be read, defaults serve: " + why;
+  std::string line = "Preferences could not be read, defaults serve: " + why.description;
   if (putAside) line += failure ? "; not renamed, " + failure->description : "; kept as " + path + ".corrupt";
   if (!said) complaints.push_back(std::move(line));
-  _complained[path] = stamp;
-  if (!putAside || failure) return std::nullopt;
+  _complained[path] = stamp.value();
+  if (!putAside || failure) return Failure{std::move(why)};
   return Dictionary();
 }
 
@@ -118,8 +154,9 @@ bool FilePreferences::store(std::string_view domain, std::string_view key, const
     complaints.push_back("Preference not stored, its file cannot be read: " + path + ", " + std::string(key));
     return false;
   }
-  all->set(std::string(key), value);
-  const auto failure = _files.replace(path, writeBinaryPropertyList(*all));
+  Dictionary changed = std::move(all).value();
+  changed.set(std::string(key), value);
+  const auto failure = _files.replace(path, writeBinaryPropertyList(changed));
   if (!failure) return true;
   complaints.push_back("Preference not stored: " + failure->description + ", " + std::string(key));
   return false;

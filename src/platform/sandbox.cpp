@@ -75,17 +75,35 @@ Result<SandboxState, std::string> restrict(const SandboxProfile& profile, int ab
 
 }  // namespace
 
+namespace {
+
+// What an administrator puts there later must be readable then, so where the directory is missing the rule
+// stands on the nearest one above that exists; never on "/".
+std::string itselfOrNearestAbove(const std::string& path) {
+  std::string place = path;
+  struct stat status {};
+  while (::stat(place.c_str(), &status) != 0) {
+    const auto slash = place.rfind('/');
+    if (slash == std::string::npos || slash == 0) return path;
+    place.resize(slash);
+  }
+  return place;
+}
+
+}  // namespace
+
 SandboxProfile veltradSandboxProfile(const Root& root) {
   const std::string messageLog = root.messageLogDirectory();
-  return {"com.florn.veltrad",
-          {root.configurationDirectory(), root.resourcesDirectory(), root.adaptorBundleDirectory(),
-           root.localeConfigurationPath(),
-           // The host's own: names and certificates, zones, libraries that those load, what the machine says.
-           "/etc", "/proc", "/sys/class/dmi", "/sys/devices/virtual/dmi", "/sys/firmware/devicetree",
-           "/usr/lib", "/usr/lib64", "/usr/local/lib", "/lib", "/lib64", "/usr/share/zoneinfo",
-           "/usr/share/ca-certificates", "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
-          {root.preferencesDirectory(), root.logsDirectory(), root.runDirectory(),
-           messageLog.substr(0, messageLog.rfind('/'))}};
+  return {
+      "com.florn.veltrad",
+      {itselfOrNearestAbove(root.configurationDirectory()), itselfOrNearestAbove(root.resourcesDirectory()),
+       root.adaptorBundleDirectory(), root.localeConfigurationPath(),
+       // The host's own: names and certificates, zones, libraries that those load, what the machine says.
+       "/etc", "/proc", "/sys/class/dmi", "/sys/devices/virtual/dmi", "/sys/firmware/devicetree", "/usr/lib",
+       "/usr/lib64", "/usr/local/lib", "/lib", "/lib64", "/usr/share/zoneinfo", "/usr/share/ca-certificates",
+       "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
+      {root.preferencesDirectory(), root.logsDirectory(), root.runDirectory(),
+       messageLog.substr(0, messageLog.rfind('/'))}};
 }
 
 Result<SandboxState, std::string> enterSandbox(const SandboxProfile& profile) {

@@ -6,9 +6,26 @@
 #include <openssl/x509_vfy.h>
 #include <unistd.h>
 
+#include <cerrno>
+
 #include "platform/log.h"
+#include "platform/shortage.h"
 
 namespace veltrad::platform {
+
+namespace {
+
+// Empties the queue. OpenSSL files what the system said under the number that errno had.
+bool shortageInErrorQueue() {
+  bool found = false;
+  while (const unsigned long error = ERR_get_error()) {
+    const int reason = ERR_GET_REASON(error);
+    found = found || (ERR_SYSTEM_ERROR(error) ? isShortage(reason) : reason == ERR_R_MALLOC_FAILURE);
+  }
+  return found;
+}
+
+}  // namespace
 
 bool TrustStore::Stamp::operator==(const Stamp& other) const {
   return device == other.device && file == other.file && size == other.size &&
@@ -25,21 +42,27 @@ TrustStore::TrustStore(std::string extraCertificatesPath)
 TrustStore::~TrustStore() = default;
 
 X509_STORE* TrustStore::current() {
-  const Stamp now = stampNow();  // before the reading: a file that changes meanwhile is read again
-  if (!_store || !(now == _stamp)) {
-    _store = make(now.size >= 0);
-    _stamp = now;
+  const std::optional<Stamp> now =
+      stampNow();  // before the reading: a file that changes meanwhile is read again
+  if (now && (!_store || !(*now == _stamp))) {
+    if (Store fresh = make(now->size >= 0)) {
+      _store = std::move(fresh);
+      _stamp = *now;
+    }
   }
   return _store.get();
 }
 
-TrustStore::Stamp TrustStore::stampNow() const {
+std::optional<TrustStore::Stamp> TrustStore::stampNow() const {
   struct stat found {};
-  if (_extraCertificatesPath.empty() || stat(_extraCertificatesPath.c_str(), &found) != 0) return {};
-  return {found.st_dev, found.st_ino, found.st_size, found.st_mtim};
+  if (_extraCertificatesPath.empty()) return Stamp{};
+  if (stat(_extraCertificatesPath.c_str(), &found) == 0)
+    return Stamp{found.st_dev, found.st_ino, found.st_size, found.st_mtim};
+  return isShortage(errno) ? std::nullopt : std::optional(Stamp{});
 }
 
 TrustStore::Store TrustStore::make(bool withExtra) const {
+  ERR_clear_error();
   Store store(X509_STORE_new());
   if (!store) return store;
   // As libcurl sets them: a trusted certificate ends the chain, whoever issued it.
@@ -47,13 +70,12 @@ TrustStore::Store TrustStore::make(bool withExtra) const {
   X509_STORE_load_path(store.get(), X509_get_default_cert_dir());
   const char* bundle = X509_get_default_cert_file();  // not every system has one beside its directory
   if (access(bundle, R_OK) == 0) X509_STORE_load_file(store.get(), bundle);
-  ERR_clear_error();
-  if (withExtra && X509_STORE_load_file(store.get(), _extraCertificatesPath.c_str()) != 1) {
-    const char* reason = ERR_reason_error_string(ERR_peek_last_error());
-    logWarning("Extra certificates in %s cannot be used (%s): expected PEM certificates",
-               _extraCertificatesPath.c_str(), reason != nullptr ? reason : "unreadable");
-  }
-  ERR_clear_error();
+  if (shortageInErrorQueue()) return nullptr;
+  if (!withExtra || X509_STORE_load_file(store.get(), _extraCertificatesPath.c_str()) == 1) return store;
+  const char* reason = ERR_reason_error_string(ERR_peek_last_error());
+  if (shortageInErrorQueue()) return nullptr;
+  logWarning("Extra certificates in %s cannot be used (%s): expected PEM certificates",
+             _extraCertificatesPath.c_str(), reason != nullptr ? reason : "unreadable");
   return store;
 }
 

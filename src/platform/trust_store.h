@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <memory>
+#include <optional>
 #include <string>
 
 // OpenSSL's own names, so that its headers stay in the body.
@@ -13,14 +14,16 @@ using X509_STORE = struct x509_store_st;
 namespace veltrad::platform {
 
 // One store serves every connection: the system's directory is looked into by need, so making a connection
-// loads nothing. The extra file is read again when its stamp has changed. One thread only.
+// loads nothing. The extra file is read again when its stamp has changed. A store that lacks something for a
+// shortage is never used: the last whole one serves, and the next question tries again. One thread only.
 class TrustStore {
  public:
   // PEM; empty or no such file: the system's authorities alone.
   explicit TrustStore(std::string extraCertificatesPath);
   ~TrustStore();
 
-  // Null only when OpenSSL cannot make a store. Lives until the next call.
+  // Null when there is none for now: no memory, or a file that could not be read for a shortage. Lives until
+  // the next call.
   X509_STORE* current();
 
  private:
@@ -36,7 +39,9 @@ class TrustStore {
   };
   using Store = std::unique_ptr<X509_STORE, Free>;
 
-  Stamp stampNow() const;
+  // Nothing: it cannot be looked at just now.
+  std::optional<Stamp> stampNow() const;
+  // Null: for now it cannot be had whole.
   Store make(bool withExtra) const;
 
   const std::string _extraCertificatesPath;

@@ -22,26 +22,30 @@ Veltra::Veltra(platform::FileStore& files, platform::Preferences& preferences, c
       _publicKeyPath(root.publicKeyPath()) {}
 
 std::string Veltra::packageVersion() const {
+  const auto stated = statedVersion();
+  return stated ? stated.value() : kVersionWhenNoneStated;
+}
+
+Result<std::string, platform::FileFailure> Veltra::statedVersion() const {
   const auto bytes = _files.read(_manifestPath, kMostResourceBytes);
-  if (!bytes) return kVersionWhenNoneStated;
+  if (!bytes && bytes.error().passes()) return Failure{bytes.error()};
+  if (!bytes) return std::string(kVersionWhenNoneStated);
   const auto list = parsePropertyList(bytes.value());
   if (!list) {
     logWarning("The package manifest states no version: %s: %s", _manifestPath.c_str(),
                list.error().detail.c_str());
-    return kVersionWhenNoneStated;
+    return std::string(kVersionWhenNoneStated);
   }
   const Dictionary* manifest = list.value().asDictionary();
   const std::string* version = manifest ? manifest->string("version") : nullptr;
-  return version && !version->empty() ? *version : kVersionWhenNoneStated;
+  return version && !version->empty() ? *version : std::string(kVersionWhenNoneStated);
 }
 
-std::optional<std::string> Veltra::publicKeyDER() const {
-  auto bytes = _files.read(_publicKeyPath, kMostResourceBytes);
-  if (!bytes) return std::nullopt;
-  return std::move(bytes).value();
+Result<std::string, platform::FileFailure> Veltra::publicKeyDER() const {
+  return _files.read(_publicKeyPath, kMostResourceBytes);
 }
 
-std::string Veltra::getPersistentIdentifierForDNU(bool respectDNU) const {
+std::optional<std::string> Veltra::getPersistentIdentifierForDNU(bool respectDNU) const {
   return _preferences.textOrStore(platform::kVeltraPreferenceDomain,
                                   respectDNU ? "uuidRespectDNU" : "uuidOverrideDNU",
                                   platform::randomUUIDText);

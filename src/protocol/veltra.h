@@ -5,10 +5,12 @@
 #include <optional>
 #include <string>
 
+#include "base/result.h"
+#include "platform/file_store.h"
+
 namespace veltrad {
 
 namespace platform {
-class FileStore;
 class Preferences;
 class Root;
 }  // namespace platform
@@ -19,12 +21,14 @@ class Veltra {
 
   // String "version" of usr/share/veltra/package.plist; "8.0" when the package states none.
   std::string packageVersion() const;
+  // The same; a failure is a shortage: for now nobody can say.
+  Result<std::string, platform::FileFailure> statedVersion() const;
   // The bytes of the resource "publicKey" of type "der"; read afresh at each call.
-  std::optional<std::string> publicKeyDER() const;
+  Result<std::string, platform::FileFailure> publicKeyDER() const;
   // A 36-character UUID text that stays the same across restarts: one while consent is respected (true),
   // another while it is overridden (false). Made and stored on first use under "uuidRespectDNU" and
-  // "uuidOverrideDNU".
-  std::string getPersistentIdentifierForDNU(bool respectDNU) const;
+  // "uuidOverrideDNU". Nothing: for a shortage nobody can say which it is.
+  std::optional<std::string> getPersistentIdentifierForDNU(bool respectDNU) const;
 
  private:
   platform::FileStore& _files;

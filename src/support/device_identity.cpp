@@ -8,35 +8,51 @@
 namespace veltrad {
 
 std::optional<std::string> DeviceIdentity::deviceProductVersion() {
-  return _properties.value("ProductVersion");
+  return value("ProductVersion");
 }
 std::optional<std::string> DeviceIdentity::deviceBuildVersion() {
-  return _properties.value("BuildVersion");
+  return value("BuildVersion");
 }
 std::optional<std::string> DeviceIdentity::deviceProductType() {
-  return _properties.value("ProductType");
+  return value("ProductType");
 }
 std::optional<std::string> DeviceIdentity::deviceName() {
-  return _properties.value("DeviceName");
+  return value("DeviceName");
 }
 std::optional<std::string> DeviceIdentity::deviceHardwareModel() {
-  return _properties.value("HWModelStr");
+  return value("HWModelStr");
 }
 std::optional<std::string> DeviceIdentity::deviceSerialNumber() {
-  return _properties.value("SerialNumber");
+  return value("SerialNumber");
 }
 
 void DeviceIdentity::copyUniqueDeviceID(char* buffer, std::size_t size) {
-  const std::optional<std::string> id = _properties.value("UniqueDeviceID");
+  const std::optional<std::string> id = value("UniqueDeviceID");
   if (!id || id->size() >= size) return;
   std::memcpy(buffer, id->c_str(), id->size() + 1);
   buffer[size - 1] = '\0';
 }
 
-bool DeviceIdentity::isInternalBuild() {
-  std::call_once(_internalBuildOnce,
-                 [this] { _internalBuild = _properties.value("ReleaseType") == "Internal"; });
+bool DeviceIdentity::mayHaveProductType(std::string_view type) {
+  const auto known = _properties.value("ProductType");
+  return !known || known.value() == type;
+}
+
+std::optional<bool> DeviceIdentity::internalBuild() {
+  {
+    const Lock held(_mutex);
+    if (_internalBuild) return _internalBuild;
+  }
+  const auto type = _properties.value("ReleaseType");
+  if (!type) return std::nullopt;
+  const Lock held(_mutex);
+  if (!_internalBuild) _internalBuild = type.value() == "Internal";
   return _internalBuild;
+}
+
+std::optional<std::string> DeviceIdentity::value(std::string_view key) {
+  const auto answer = _properties.value(key);
+  return answer ? answer.value() : std::nullopt;
 }
 
 }  // namespace veltrad

@@ -2,9 +2,11 @@
 #pragma once
 
 #include <cstddef>
-#include <mutex>
 #include <optional>
 #include <string>
+#include <string_view>
+
+#include "base/mutex.h"
 
 namespace veltrad {
 
@@ -13,7 +15,7 @@ class DeviceProperties;
 }
 
 // Asks the device property service under fixed keys. Nothing is cached but whether the build is an internal
-// one. The service must outlive it.
+// one. What the service cannot say for now is nothing, and is not remembered. The service must outlive it.
 class DeviceIdentity {
  public:
   explicit DeviceIdentity(platform::DeviceProperties& properties) : _properties(properties) {}
@@ -30,16 +32,22 @@ class DeviceIdentity {
   // as it is when there is no id, or none that fits.
   void copyUniqueDeviceID(char* buffer, std::size_t size);
 
-  // True when the release type is exactly "Internal". Decided at the first call, for the life of this object.
-  bool isInternalBuild();
+  // False only for another type than this, or none: what cannot be read just now may be it.
+  bool mayHaveProductType(std::string_view type);
+
+  // True when the release type is exactly "Internal". Decided when it can first be read, for the life of this
+  // object; until then false, or nothing.
+  bool isInternalBuild() { return internalBuild().value_or(false); }
+  std::optional<bool> internalBuild();
 
  private:
+  std::optional<std::string> value(std::string_view key);
+
   // Constant after construction.
   platform::DeviceProperties& _properties;
 
-  // Written once under _internalBuildOnce, read without a lock afterwards.
-  std::once_flag _internalBuildOnce;
-  bool _internalBuild = false;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // the first answer is kept
+  std::optional<bool> _internalBuild GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad

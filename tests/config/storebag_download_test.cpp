@@ -29,11 +29,12 @@ struct Fetch {
       : lastModified(std::move(held)) {
     const ExpectedLog log(lines);
     StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
-    storebag = download.fetchStorebagWithName(name, maxAge, notModified, &lastModified);
+    storebag = download.fetchStorebagWithName(name, maxAge, notModified, &lastModified, attempted);
   }
   std::optional<Dictionary> storebag;
   std::int32_t maxAge = kUntouched;
   bool notModified = false;
+  bool attempted = true;
   std::optional<std::string> lastModified;
 };
 
@@ -153,12 +154,14 @@ struct Choice {
     Configuration configuration(environment);
     configuration.answers(container(writeXMLPropertyList(storebag)), {{"Cache-Control", cacheControl}});
     StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
-    section = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified, nullptr);
+    section = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified, nullptr,
+                                                                attempted);
   }
   std::optional<Dictionary> section;
   std::int32_t maxAge = -77;
   std::optional<std::string> version = "as it was";
   bool notModified = false;
+  bool attempted = true;
 };
 
 const std::string kChoosing = "fetchStorebagForEnvironmentAndClientType: ";

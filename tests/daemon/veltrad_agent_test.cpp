@@ -62,9 +62,12 @@ struct Silent final : MessageLog {
 
 // Answers as the test says; may be told to hold an exchange until it is let go.
 struct Source final : StorebagSource {
-  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
-      std::int32_t, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-      std::optional<std::string>* lastModified) override {
+  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(std::int32_t, std::int32_t& maxAge,
+                                                                     std::optional<std::string>& version,
+                                                                     bool& notModified,
+                                                                     std::optional<std::string>* lastModified,
+                                                                     bool& attempted) override {
+    attempted = attempts;
     std::unique_lock held(mutex);
     ++fetches;
     changed.notify_all();
@@ -93,6 +96,7 @@ struct Source final : StorebagSource {
   std::string newLastModified;
   std::int32_t age = 3600;
   bool answersNotModified = false;
+  bool attempts = true;
   bool hold = false;
   int fetches = 0;
 };

@@ -19,6 +19,7 @@ class FakeFileStore final : public platform::FileStore {
   Result<std::string, platform::FileFailure> read(const std::string& path,
                                                   std::size_t most = 16u << 20) override {
     std::lock_guard lock(_mutex);
+    if (_short) return Failure{failureOf(path, Kind::shortage)};
     if (const auto failure = _readFailures.find(path); failure != _readFailures.end())
       return Failure{failureOf(path, failure->second)};
     const File* file = find(path);
@@ -29,6 +30,7 @@ class FakeFileStore final : public platform::FileStore {
   std::optional<platform::FileFailure> replace(const std::string& path, std::string_view bytes,
                                                unsigned mode = 0600) override {
     std::lock_guard lock(_mutex);
+    if (_short) return failureOf(path, Kind::shortage);
     if (_writeFailure) return failureOf(path, *_writeFailure);
     _files[path] = {std::string(bytes), mode, ++_lastStamp};
     ++_replaced;
@@ -43,10 +45,11 @@ class FakeFileStore final : public platform::FileStore {
     _files.erase(from);
     return std::nullopt;
   }
-  std::optional<std::uint64_t> stamp(const std::string& path) override {
+  Result<platform::FileStamp, platform::FileFailure> stamp(const std::string& path) override {
     std::lock_guard lock(_mutex);
+    if (_stampsFail) return Failure{failureOf(path, Kind::shortage)};
     const File* file = find(path);
-    return file ? std::optional(file->stamp) : std::nullopt;
+    return file ? platform::FileStamp(file->stamp) : platform::FileStamp();
   }
 
   // What somebody else does to the disk; never fails.
@@ -75,6 +78,11 @@ class FakeFileStore final : public platform::FileStore {
     _readFailures.erase(path);
     if (kind) _readFailures.emplace(path, *kind);
   }
+  // No file at all can be read or written just now.
+  void runShort(bool isShort, bool stampsFail = false) {
+    _short = isShort;
+    _stampsFail = isShort && stampsFail;
+  }
 
  private:
   struct File {
@@ -88,9 +96,9 @@ class FakeFileStore final : public platform::FileStore {
     return file == _files.end() ? nullptr : &file->second;
   }
   static platform::FileFailure failureOf(const std::string& path, Kind kind) {
-    static const char* const kTexts[] = {"No such file or directory", "Permission denied",
-                                         "larger than was asked for", "No space left on device",
-                                         "Input/output error"};
+    static const char* const kTexts[] = {
+        "No such file or directory", "Permission denied", "larger than was asked for",
+        "No space left on device",   "Is a directory",    "Too many open files"};
     return {kind, path + ": " + kTexts[static_cast<int>(kind)]};
   }
 
@@ -98,6 +106,8 @@ class FakeFileStore final : public platform::FileStore {
   std::map<std::string, File> _files;
   std::map<std::string, Kind> _readFailures;
   std::optional<Kind> _writeFailure;
+  bool _short = false;
+  bool _stampsFail = false;
   int _replaced = 0;
   std::uint64_t _lastStamp = 0;
 };

@@ -47,8 +47,9 @@ struct FakeRandom final : platform::Random {
 // Begins as a customer's machine with every fact but "ReleaseType".
 class FakeDeviceProperties final : public platform::DeviceProperties {
  public:
-  std::optional<std::string> value(std::string_view key) override {
+  platform::DeviceProperty value(std::string_view key) override {
     std::lock_guard lock(_mutex);
+    if (_short) return Failure{platform::FileFailure{platform::FileFailure::Kind::shortage, "no descriptor"}};
     const auto found = _values.find(key);
     return found == _values.end() ? std::nullopt : std::optional(found->second);
   }
@@ -56,9 +57,11 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
     std::lock_guard lock(_mutex);
     _values[key] = value;
   }
+  void runShort(bool isShort) { _short = isShort; }
 
  private:
   std::mutex _mutex;
+  bool _short = false;
   std::map<std::string, std::string, std::less<>> _values{
       {"ProductVersion", "12"},
       {"BuildVersion", "12A301"},
@@ -79,6 +82,7 @@ class MemoryPreferences {
     _preferences.setValue(platform::kVeltraPreferenceDomain, key, value);
   }
   void clear() { _files.remove("/preferences/com.florn.veltra.plist"); }
+  void runShort(bool isShort) { _files.runShort(isShort); }
 
  private:
   FakeFileStore _files;

@@ -20,6 +20,8 @@ class MachinePropertiesTest : public ::testing::Test {
  protected:
   void put(const Dictionary& list) { _files.put(kList, writeXMLPropertyList(list)); }
 
+  Text value(std::string_view key) { return _properties.value(key).value(); }
+
   RecordedLog _log;
   FakeFileStore _files;
   MachineProperties _properties{_files, kList};
@@ -27,36 +29,36 @@ class MachinePropertiesTest : public ::testing::Test {
 
 TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
   _files.put("/etc/os-release", "NAME=x\nVERSION_ID=\"12\"\nBUILD_ID='2026.1'\n");
-  EXPECT_EQ(_properties.value("ProductVersion"), "12");
-  EXPECT_EQ(_properties.value("BuildVersion"), "2026.1");
+  EXPECT_EQ(value("ProductVersion"), "12");
+  EXPECT_EQ(value("BuildVersion"), "2026.1");
   put({{"ProductVersion", "17.4"}, {"BuildVersion", ""}, {"ReleaseType", "Internal"}, {"DeviceName", 5}});
-  EXPECT_EQ(_properties.value("ProductVersion"), "17.4");
-  EXPECT_EQ(_properties.value("BuildVersion"), Text());
-  EXPECT_EQ(_properties.value("ReleaseType"), "Internal");
-  EXPECT_EQ(_properties.value("DeviceName"), "Computer");  // no text: as if the key were absent
+  EXPECT_EQ(value("ProductVersion"), "17.4");
+  EXPECT_EQ(value("BuildVersion"), Text());
+  EXPECT_EQ(value("ReleaseType"), "Internal");
+  EXPECT_EQ(value("DeviceName"), "Computer");  // no text: as if the key were absent
   put({{"BuildVersion", "B"}});
-  EXPECT_EQ(_properties.value("BuildVersion"), "B");
-  EXPECT_EQ(_properties.value("ReleaseType"), Text());
+  EXPECT_EQ(value("BuildVersion"), "B");
+  EXPECT_EQ(value("ReleaseType"), Text());
 }
 
 TEST_F(MachinePropertiesTest, AsksDMIThenTheDeviceTree) {
   for (const char* key : {"ProductVersion", "ProductType", "UniqueDeviceID", "ReleaseType", "unheard of"})
-    EXPECT_EQ(_properties.value(key), Text()) << key;
+    EXPECT_EQ(value(key), Text()) << key;
   _files.put("/usr/lib/os-release", "VERSION_ID=13\n");
   _files.put("/proc/sys/kernel/osrelease", "6.1.0-18\n");
   _files.put("/proc/device-tree/model", std::string_view("Board Model B\0", 14));
-  EXPECT_EQ(_properties.value("ProductVersion"), "13");
-  EXPECT_EQ(_properties.value("BuildVersion"), "6.1.0-18");
-  EXPECT_EQ(_properties.value("ProductType"), "Board Model B");
-  EXPECT_EQ(_properties.value("DeviceName"), "Embedded");
+  EXPECT_EQ(value("ProductVersion"), "13");
+  EXPECT_EQ(value("BuildVersion"), "6.1.0-18");
+  EXPECT_EQ(value("ProductType"), "Board Model B");
+  EXPECT_EQ(value("DeviceName"), "Embedded");
   _files.put("/sys/class/dmi/id/product_name", "Workbench 3 \n");
   _files.put("/sys/class/dmi/id/board_name", "WB3-B\n");
   _files.put("/sys/class/dmi/id/product_serial", " \n");
   _files.put("/sys/class/dmi/id/chassis_type", "10\n");
-  EXPECT_EQ(_properties.value("ProductType"), "Workbench 3");
-  EXPECT_EQ(_properties.value("HWModelStr"), "WB3-B");
-  EXPECT_EQ(_properties.value("SerialNumber"), Text());
-  EXPECT_EQ(_properties.value("DeviceName"), "Laptop");
+  EXPECT_EQ(value("ProductType"), "Workbench 3");
+  EXPECT_EQ(value("HWModelStr"), "WB3-B");
+  EXPECT_EQ(value("SerialNumber"), Text());
+  EXPECT_EQ(value("DeviceName"), "Laptop");
 }
 
 TEST_F(MachinePropertiesTest, NamesTheClassOfTheDevice) {
@@ -69,21 +71,21 @@ TEST_F(MachinePropertiesTest, NamesTheClassOfTheDevice) {
       {"/etc/machine-info", "CHASSIS=tablet\n", "Tablet"}};
   for (const auto& [file, bytes, name] : cases) {
     _files.put(file, bytes);
-    EXPECT_EQ(_properties.value("DeviceName"), name);
+    EXPECT_EQ(value("DeviceName"), name);
   }
 }
 
 TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChanges) {
   const std::string id = "3d1219c7c4c5404aaa1f6d2a48adfda4";
   _files.put("/etc/machine-id", id + "\n");
-  const auto device = _properties.value("UniqueDeviceID");
+  const auto device = value("UniqueDeviceID");
   EXPECT_THAT(device.value_or(""), ::testing::MatchesRegex("[0-9a-f]{40}"));
   // Not what any other program makes of it that takes the bare SHA-256.
   EXPECT_NE(device, "0035969ec53f6e7f0fb40f08cc9ed4783aa99c20");
   _files.put("/etc/machine-id", "4d1219c7c4c5404aaa1f6d2a48adfda4\n");
-  EXPECT_NE(_properties.value("UniqueDeviceID"), device);
+  EXPECT_NE(value("UniqueDeviceID"), device);
   _files.put("/etc/machine-id", "uninitialized\n");
-  EXPECT_EQ(_properties.value("UniqueDeviceID"), Text());
+  EXPECT_EQ(value("UniqueDeviceID"), Text());
 }
 
 TEST(Locale, FindsTheCountryInALocaleName) {

@@ -21,6 +21,7 @@ constexpr std::size_t kMost = 1u << 20;
 
 class DiskFileStoreTest : public ::testing::Test {
  protected:
+  FileStamp stampOf(const std::string& path) { return _files.stamp(path).value(); }
   TemporaryDirectory _directory;
   DiskFileStore _files;
 };
@@ -80,18 +81,18 @@ TEST_F(DiskFileStoreTest, ReadsWithinItsBoundAndRegularFilesAlone) {
 
 TEST_F(DiskFileStoreTest, TheStampChangesWithEveryKindOfChange) {
   const std::string path = _directory.path("x");
-  EXPECT_FALSE(_files.stamp(path));
+  EXPECT_FALSE(stampOf(path));
   _directory.write("x", "1");
-  const auto first = _files.stamp(path);
+  const auto first = stampOf(path);
   ASSERT_TRUE(first);
-  EXPECT_EQ(_files.stamp(path), first);
+  EXPECT_EQ(stampOf(path), first);
   ASSERT_FALSE(_files.replace(path, "1", 0600));
-  const auto second = _files.stamp(path);
+  const auto second = stampOf(path);
   EXPECT_NE(second, first);
   _directory.write("x", "12");
-  EXPECT_NE(_files.stamp(path), second);
+  EXPECT_NE(stampOf(path), second);
   ASSERT_FALSE(_files.rename(path, path + ".corrupt"));
-  EXPECT_FALSE(_files.stamp(path));
+  EXPECT_FALSE(stampOf(path));
   EXPECT_EQ(_directory.read("x.corrupt"), "12");
 }
 

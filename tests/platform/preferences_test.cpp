@@ -74,11 +74,11 @@ TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {
 
 TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
   put({{"empty", ""}});
-  EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", randomUUIDText).size(), 36u);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", randomUUIDText)->size(), 36u);
   _files.failWrites(Kind::noSpace);
   _log.expectLine(Level::error,
                   "Preference not stored: /preferences/com.florn.veltra.plist: No space left on device");
-  const std::string made = _preferences.textOrStore(kDomain, "id", randomUUIDText);
+  const auto made = _preferences.textOrStore(kDomain, "id", randomUUIDText);
   EXPECT_EQ(_preferences.textOrStore(kDomain, "id", randomUUIDText), made);
   EXPECT_EQ(_preferences.text(kDomain, "id"), made);
   _files.failWrites({});
@@ -90,13 +90,13 @@ TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
   TemporaryDirectory directory;
   DiskFileStore files;
   FilePreferences preferences(files, directory.path());
-  std::vector<std::string> texts(4);
+  std::vector<std::optional<std::string>> texts(4);
   std::vector<std::thread> callers;
-  for (std::string& text : texts) {
+  for (auto& text : texts) {
     callers.emplace_back([&] { text = preferences.textOrStore(kDomain, "id", randomUUIDText); });
   }
   for (auto& caller : callers) caller.join();
-  EXPECT_EQ(std::set<std::string>(texts.begin(), texts.end()).size(), 1u);
+  EXPECT_EQ(std::set(texts.begin(), texts.end()).size(), 1u);
   EXPECT_EQ(FilePreferences(files, directory.path()).text(kDomain, "id"), texts[0]);
 }
 

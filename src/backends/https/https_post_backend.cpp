@@ -19,7 +19,7 @@ constexpr std::uint16_t kSessionTypeStop = 1;
 const char* reasonOf(platform::HTTPError::Kind kind) {
   switch (kind) {
     case platform::HTTPError::Kind::transport:
-    case platform::HTTPError::Kind::tooLarge:
+    case platform::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
       return "event lost: the post failed";
     case platform::HTTPError::Kind::tooMany:
       return "event lost: too many posts under way";
@@ -234,7 +234,7 @@ const std::string& HTTPSPostBackend::clientIdentifier() const {
 bool HTTPSPostBackend::loggingAllowed() const {
   if (_dnuType == 0 && _dnuEnabled) return true;
   if (!_forceEventLogging) return false;
-  const std::uint32_t environment = _services.settings.currentEnvironment();
+  const auto environment = _services.settings.currentEnvironment();  // nothing: for now nobody can say
   return environment == 1 || environment == 2;
 }
 

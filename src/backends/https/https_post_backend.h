@@ -44,7 +44,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   void logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
                   const std::optional<std::string>& country) const;
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
-  std::string getPersistentIdentifierForCustomClientIDSuffix(
+  std::optional<std::string> getPersistentIdentifierForCustomClientIDSuffix(
       const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const;
   bool updatePostLink(const Dictionary& entry);
   void resetBackendStateWithClient(const Dictionary* entry);

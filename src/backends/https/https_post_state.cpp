@@ -41,7 +41,12 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  return std::shared_ptr<HTTPSPostBackend>(new HTTPSPostBackend(services, name, *profile, *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(services, name, *profile, *productFamily));
+  if (made->_uuidRespectDnu.empty() || made->_uuidOverrideDnu.empty()) {
+    logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
+    return nullptr;
+  }
+  return made;
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, const std::string& name,
@@ -51,8 +56,8 @@ HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, const std::s
       _dnuEnabled(diagnosticLogSubmissionEnabled(services.preferences)),
       _forceEventLogging(
           textMeansYes(services.preferences.text(platform::kVeltraPreferenceDomain, "forceEventLogging"))),
-      _uuidRespectDnu(services.library.getPersistentIdentifierForDNU(true)),
-      _uuidOverrideDnu(services.library.getPersistentIdentifierForDNU(false)),
+      _uuidRespectDnu(services.library.getPersistentIdentifierForDNU(true).value_or("")),
+      _uuidOverrideDnu(services.library.getPersistentIdentifierForDNU(false).value_or("")),
       _held(std::make_shared<HeldEvents>(services.counters)) {
   _postURL = services.preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL");
   if (_postURL)
@@ -129,7 +134,12 @@ std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
 
   resetBackendStateWithClient(&entry);
   if (entry.contains("custom_clientId")) {
-    _uuidCustom = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
+    auto identifier = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
+    if (!identifier) {  // another would be no better than a wrong one
+      _services.counters.count("back end disabled: its client's identifier cannot be read");
+      return kBackendDisabled;
+    }
+    _uuidCustom = std::move(identifier);
   }
   logDebug(
       "HTTPSPostBackend(updateBackendState): %s: client found %s:%s, state=%d, samplingFactor=%f, "
@@ -182,12 +192,14 @@ void HTTPSPostBackend::takeSampling(const ClientVerdict& verdict, const std::opt
   if (verdict.overrideReached) _overrideSampling = verdict.overrideSampling;
 }
 
-std::string HTTPSPostBackend::getPersistentIdentifierForCustomClientIDSuffix(
+std::optional<std::string> HTTPSPostBackend::getPersistentIdentifierForCustomClientIDSuffix(
     const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const {
   const std::string key = "uuid:" + clientName.value_or("") + ":" + serviceName.value_or("");
-  std::string value =
+  auto value =
       _services.preferences.textOrStore(platform::kVeltraPreferenceDomain, key, platform::randomUUIDText);
-  logInfo("getPersistentIdentifierForCustomClientIDSuffix: The value for %s: %s", key.c_str(), value.c_str());
+  if (!value) return std::nullopt;
+  logInfo("getPersistentIdentifierForCustomClientIDSuffix: The value for %s: %s", key.c_str(),
+          value->c_str());
   return value;
 }
 

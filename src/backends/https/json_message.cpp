@@ -34,12 +34,16 @@ Fate fateOf(const Value& value) {
 }
 
 // For a log line, which need not hold a mebibyte.
-std::string printed(const Value& value) {
+std::string cut(std::string text) {
   constexpr std::size_t kMost = 1024;
-  if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
-  std::string text = writeJSON(value);
   if (text.size() <= kMost) return text;
-  return std::string(withoutIncompleteEnd(std::string_view(text).substr(0, kMost))) + "…";
+  const std::string kept(withoutIncompleteEnd(std::string_view(text).substr(0, kMost)));
+  return fmt::format("{}… ({} bytes cut)", kept, text.size() - kept.size());
+}
+
+std::string printed(const Value& value) {
+  if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
+  return cut(writeJSON(value));
 }
 
 double finiteOrMinusOne(double seconds) {
@@ -55,7 +59,7 @@ std::size_t restrictEventForJSON(Dictionary& event) {
     if (fate == Fate::remove) {
       logWarning(
           "HTTPSPostBackend(createMessageForPostAndLogging): Quillfen unable to handle key: %s, value: %s",
-          key.c_str(), printed(value).c_str());
+          cut(key).c_str(), printed(value).c_str());
     }
     changed.emplace_back(key, value);
   }
