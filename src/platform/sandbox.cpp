@@ -82,7 +82,7 @@ namespace {
 std::string itselfOrNearestAbove(const std::string& path) {
   std::string place = path;
   struct stat status {};
-  while (::stat(place.c_str(), &status) != 0) {
+  while (::stat(place.c_str(), &status) != 0 || !S_ISDIR(status.st_mode)) {
     const auto slash = place.rfind('/');
     if (slash == std::string::npos || slash == 0) return path;
     place.resize(slash);

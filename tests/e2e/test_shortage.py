@@ -1,0 +1,174 @@
+"""A shortage that passes, and what the process brings from whoever started it: the daemon as it ships, sandbox included,
+with few descriptors, closed standard descriptors, a foreign environment."""
+import contextlib
+import os
+import resource
+import shutil
+import subprocess
+
+from harness import DEADLINE, DEVICE, SystemTest, Wire, program, wait_until
+
+
+class Shortage(SystemTest):
+    def limit(self, daemon, more=None):
+        """So many descriptors from the lowest free one on; nothing: as many as at the start."""
+        pid = daemon.popen.pid
+        hard = resource.prlimit(pid, resource.RLIMIT_NOFILE)[1]
+        used = {int(number) for number in os.listdir(f"/proc/{pid}/fd")}
+        free = min(set(range(len(used) + 1)) - used)
+        resource.prlimit(pid, resource.RLIMIT_NOFILE, (hard if more is None else free + more, hard))
+
+    def connect(self):
+        """A client, and what it is told where it gets no connection."""
+        client = Wire(self.root, hello=False)
+        self.addCleanup(client.close)
+        with contextlib.suppress(ConnectionError):  # refused already
+            client.send(Wire.HELLO, {"wire": 1, "library": "8.0"})
+        kind, _, body = client.frame()
+        return client, body["error"]["description"] if kind == Wire.REFUSAL else None
+
+    def refusal(self):
+        client, told = self.connect()
+        client.close()
+        return told
+
+    def test_a_full_table_is_told_and_passes(self):
+        with self.serving("A connection could not be accepted", wrapper=("prlimit", "--nofile=40:40")) as daemon:
+            for _ in range(2):
+                clients, told = [], None
+                while told is None:
+                    client, told = self.connect()
+                    clients.append(client)
+                    self.assertLess(len(clients), 40)
+
+                def none_left():  # those of who was refused may go only now
+                    self.limit(daemon, 0)
+                    return "the daemon has no descriptor left" in (self.refusal() or "")
+                wait_until(none_left, "the spare descriptor's answer")
+                self.limit(daemon)
+                for client in clients:
+                    client.close()
+                wait_until(lambda: self.refusal() is None, "a client that is served again")
+            self.assertEqual(self.open()[1], ["httppost"])
+
+    def test_what_could_not_be_read_is_read_again(self):
+        """Preferences, device properties, deployment, environment, key: none of it was ever read before."""
+        with self.serving("the device's identifiers") as daemon:
+            client = Wire(self.root)
+            client.describe()
+            self.limit(daemon, 0)
+            for _ in range(2):
+                reply = client.call("startConfigWithCompletionHandler:")
+                self.assertNotIn("httppost", reply["results"].get("backends", []))
+            self.assertEqual(self.lab.storebags(), [])
+            self.limit(daemon)
+            reply = client.call("startConfigWithCompletionHandler:")
+            self.assertEqual(reply["results"]["backends"], ["httppost"])
+            client.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"after": True})
+            event, = self.lab.wait_for_events(1, after=True)
+            self.assertEqual(event["_build"], DEVICE["BuildVersion"])
+            client.close()
+
+    def test_a_shortage_changes_no_identifier(self):
+        """The file is there all the time; a session that starts during the shortage gets what it says, or nothing."""
+        with self.serving("the device's identifiers") as daemon:
+            client, other = Wire(self.root), Wire(self.root)
+            for wire in (client, other):
+                wire.describe()
+            client.call("startConfigWithCompletionHandler:")
+            before, = self.lab.received("events", 1)
+            self.limit(daemon, 0)
+            self.assertEqual(other.call("startConfigWithCompletionHandler:")["results"].get("backends"), ["httppost"])
+            self.limit(daemon)
+            other.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"during": True})
+            self.lab.wait_for_events(1, during=True)
+            self.assertEqual({post["body"]["clientId"] for post in self.lab.received("events")},
+                             {before["body"]["clientId"]})
+            client.close()
+            other.close()
+
+    def test_entitlements_during_a_shortage(self):
+        """However far a connection gets, the next one finds the rules as they are."""
+        with self.serving("A connection could not be accepted", "Entitlements could not be read just now") as daemon:
+            self.assertIsNone(self.refusal())
+            for more in range(7):
+                with self.subTest(more=more):
+                    self.root.grant([{"gid": os.getgid(), "entitlements": {"com.florn.private.veltrad": True}}])
+                    self.limit(daemon, more)
+                    self.refusal()
+                    self.limit(daemon)
+                    self.assertIsNone(self.refusal())
+
+    def test_a_stop_ends_only_its_own_socket(self):
+        for name, put in (("a file", lambda path: open(path, "w").close()), ("a link", lambda path: os.symlink("x", path)),
+                          ("nothing", lambda path: None)):
+            with self.subTest(name):
+                with self.serving():
+                    os.unlink(self.root.socket)
+                    put(self.root.socket)
+                self.assertEqual(os.path.lexists(self.root.socket), name != "nothing")
+                if name != "nothing":
+                    os.unlink(self.root.socket)
+
+
+class Start(SystemTest):
+    def test_closed_standard_descriptors(self):
+        daemon = subprocess.Popen(["/bin/sh", "-c", 'exec "$0" <&- >&- 2>&-', program("veltrad")],
+                                  env=self.root.environment(VELTRA_LOG="debug"), start_new_session=True)
+        self.addCleanup(daemon.wait)
+        self.addCleanup(daemon.kill)
+        wait_until(lambda: os.path.exists(self.root.socket), "the socket")
+        self.assertEqual(self.open()[1], ["httppost"])
+        self.assertEqual((self.root.path / "run/veltrad/lock").read_text(), f"{daemon.pid}\n")
+        self.assertEqual({os.readlink(f"/proc/{daemon.pid}/fd/{number}") for number in range(3)}, {"/dev/null"})
+        daemon.terminate()
+        self.assertEqual(daemon.wait(DEADLINE), 0)
+
+    def test_a_foreign_environment(self):
+        """OpenSSL would refuse every server, and its keys would stand in the daemon's own log directory."""
+        configuration = self.root.path / "etc/openssl.cnf"
+        configuration.write_text("openssl_conf = a\n[a]\nssl_conf = b\n[b]\nsystem_default = c\n[c]\n"
+                                 "MaxProtocol = TLSv1.1\n")
+        keys = self.root.path / "var/log/veltrad/keys"
+        with self.serving(env={"OPENSSL_CONF": str(configuration), "SSLKEYLOGFILE": str(keys)}):
+            self.assertEqual(self.open()[1], ["httppost"])
+            self.lab.received("events", 1)
+        self.assertFalse(keys.exists())
+
+    def test_arguments(self):
+        for arguments, status, words in ((["--version"], 0, r"^veltrad 8\.\d+\n$"), (["--help"], 0, r"(?s)^Usage: veltrad.*--version"),
+                                         (["--verbose"], 2, "veltrad: .*--verbose"), (["--help", "x"], 2, "veltrad: .*x")):
+            done = subprocess.run([program("veltrad"), *arguments], env=self.root.environment(), capture_output=True,
+                                  timeout=DEADLINE)
+            self.assertEqual(done.returncode, status)
+            self.assertRegex((done.stderr if status else done.stdout).decode(), words)
+            self.assertEqual(done.stdout if status else done.stderr, b"")
+        self.assertFalse((self.root.path / "run").exists())
+
+    def test_a_key_that_comes_later(self):
+        """Its directory is missing at the start, and cannot be made where a file stands in the way."""
+        for in_the_way in (False, True):
+            with self.subTest(in_the_way=in_the_way):
+                shutil.rmtree(self.root.path / "usr")
+                if in_the_way:
+                    (self.root.path / "usr").mkdir()
+                    (self.root.path / "usr/share").write_text("")
+                with self.serving():
+                    if in_the_way:
+                        (self.root.path / "usr/share").unlink()
+                    self.root.use(self.lab)
+                    self.assertEqual(self.open()[1], ["httppost"])
+
+    def test_unfinished_files_are_removed(self):
+        names = {"com.florn.veltra.plist.0a1B2c3D.new": False, "counters.json.01234567.new": False,
+                 "x.0123456.new": True, "x.0123456g.new": True, ".01234567.new": True, "x.01234567.new.old": True}
+        directories = [self.root.path / "var/lib/veltrad/preferences", self.root.path / "run/veltrad"]
+        for directory in directories:
+            directory.mkdir(parents=True, exist_ok=True)
+            for name in names:
+                (directory / name).write_text("half")
+            (directory / "y.01234567.new").mkdir()
+        with self.serving():
+            for directory in directories:
+                self.assertEqual({name: (directory / name).exists() for name in names}, names)
+                self.assertTrue((directory / "y.01234567.new").is_dir())
