@@ -22,6 +22,13 @@ Result<Value, JSONError> parseJSON(std::string_view text);
 enum class JSONStyle { compact, pretty };
 // The reverse of parseJSON. A real that is not finite is written as null; a text that is no UTF-8 is mended.
 std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact);
+// The beginning of the compact text, at most `most` bytes and whole characters, and how many bytes are left
+// out. Keeps no more than that, however long the text would be.
+struct JSONExcerpt {
+  std::string text;
+  std::size_t leftOut = 0;
+};
+JSONExcerpt excerptOfJSON(const Value& value, std::size_t most);
 // A bound on the bytes of the compact text of a dictionary of texts, numbers, booleans and dates, without
 // writing it; containers and data in it are not counted.
 std::size_t jsonBytesAtMost(const Dictionary& flat);

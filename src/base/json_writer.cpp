@@ -24,6 +24,25 @@ class StringStream {
   std::string& _out;
 };
 
+// The same that keeps the beginning alone.
+class ExcerptStream {
+ public:
+  using Ch = char;
+  ExcerptStream(JSONExcerpt& out, std::size_t most) : _out(out), _most(most) {}
+  void Put(char c) {
+    if (_out.text.size() < _most) {
+      _out.text.push_back(c);
+    } else {
+      ++_out.leftOut;
+    }
+  }
+  void Flush() {}
+
+ private:
+  JSONExcerpt& _out;
+  const std::size_t _most;
+};
+
 template <typename Writer>
 void putText(Writer& writer, const std::string& text, bool isKey) {
   if (!isUTF8(text)) return putText(writer, toUTF8(text), isKey);
@@ -101,6 +120,17 @@ std::string writeJSON(const Value& value, JSONStyle style) {
     rapidjson::Writer<StringStream> writer(stream);
     put(writer, value);
   }
+  return out;
+}
+
+JSONExcerpt excerptOfJSON(const Value& value, std::size_t most) {
+  JSONExcerpt out;
+  ExcerptStream stream(out, most);
+  rapidjson::Writer<ExcerptStream> writer(stream);
+  put(writer, value);
+  const std::size_t whole = out.leftOut > 0 ? withoutIncompleteEnd(out.text).size() : out.text.size();
+  out.leftOut += out.text.size() - whole;
+  out.text.resize(whole);
   return out;
 }
 

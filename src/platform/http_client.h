@@ -70,7 +70,6 @@ struct HTTPError {
     tooMany,    // over the lane's bound; nothing was sent
     shortage,   // no descriptor, thread or memory for it just now; nothing was sent
     stopping,   // the daemon is stopping
-    tooLarge,   // the answer is over its bound; `status` is the answer's
   };
   Kind kind = Kind::transport;
   std::string description;  // one line, a system text: "Could not resolve host: x"

@@ -27,6 +27,8 @@ void takeUtilitySchedulingClass() {
 
 void shareHeaps() {
   mallopt(M_ARENA_MAX, 2);
+  // A large block goes back to the system when it is freed; glibc would raise the threshold with each.
+  mallopt(M_MMAP_THRESHOLD, 256 << 10);
 }
 
 void returnFreeMemory() {

@@ -34,16 +34,19 @@ Fate fateOf(const Value& value) {
 }
 
 // For a log line, which need not hold a mebibyte.
-std::string cut(std::string text) {
-  constexpr std::size_t kMost = 1024;
-  if (text.size() <= kMost) return text;
-  const std::string kept(withoutIncompleteEnd(std::string_view(text).substr(0, kMost)));
+constexpr std::size_t kMostPrinted = 1024;
+
+std::string cut(const std::string& text) {
+  if (text.size() <= kMostPrinted) return text;
+  const std::string_view kept = withoutIncompleteEnd(std::string_view(text).substr(0, kMostPrinted));
   return fmt::format("{}… ({} bytes cut)", kept, text.size() - kept.size());
 }
 
 std::string printed(const Value& value) {
   if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
-  return cut(writeJSON(value));
+  const JSONExcerpt excerpt = excerptOfJSON(value, kMostPrinted);
+  return excerpt.leftOut == 0 ? excerpt.text
+                              : fmt::format("{}… ({} bytes cut)", excerpt.text, excerpt.leftOut);
 }
 
 double finiteOrMinusOne(double seconds) {

@@ -30,6 +30,7 @@ FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account
 const char* fateAfter(platform::HTTPError::Kind kind) {
   switch (kind) {
     case platform::HTTPError::Kind::transport:
+    case platform::HTTPError::Kind::tooLarge:
       return "file lost: the exchange with the server failed";
     case platform::HTTPError::Kind::tooMany:
     case platform::HTTPError::Kind::shortage:

@@ -1,0 +1,120 @@
+"""What one user makes the daemon keep, whatever is sent: all value types, sizes, depths and states, with and without
+consent, to collectors that hang, answer hugely or never."""
+import concurrent.futures
+import pathlib
+import plistlib
+import random
+import socket
+import time
+import unittest
+
+from harness import SystemTest, Wire, storebag, wait_until
+
+MIB = 1 << 20
+SEND = "sendMessageWithCategory:type:payload:reply:"
+LOG_DATA = "uploadLogData:completionHandler:"
+CLIENTS = 12
+VALUES = (
+    lambda r: "x" * r.choice((1, 200, 900_000)),
+    lambda r: "\x01" * r.choice((20, 300_000)),
+    lambda r: "€\U0001f600" * r.choice((9, 60_000)),
+    lambda r: b"\0" * r.choice((1, 900_000)),
+    lambda r: [{}] * r.choice((1, 49_000)),
+    lambda r: {f"k{i}": i for i in range(r.choice((3, 25_000)))},
+    lambda r: [["n" * 5_000] * 90] * 15,  # shared objects
+    lambda r: nested(r.choice((5, 59))),
+    lambda r: r.choice((True, -1, 1 << 63, 0.5, float("nan"))),
+)
+
+
+def nested(depth):
+    return [nested(depth - 1)] if depth else 1
+
+
+def message(r):
+    if r.random() < 0.3:
+        return {f"{i:05}": "v" * 30 for i in range(r.choice((10, 9_000)))}
+    return {f"f{i}": r.choice(VALUES)(r) for i in range(r.choice((1, 3)))}
+
+
+class Memory(SystemTest):
+    def resident(self, daemon):
+        status = pathlib.Path(f"/proc/{daemon.popen.pid}/status").read_text()
+        return int(status.split("VmRSS:")[1].split()[0]) * 1024
+
+    def at_rest(self, daemon):
+        """After the first post, and a while without a session."""
+        session, _ = self.open()
+        session.send()
+        self.lab.wait_for_events(1)
+        self.assertEqual(session.close(), 0)
+        seen = [0]
+        def settled():
+            seen.append(self.resident(daemon))
+            return abs(seen[-1] - seen[-2]) < 64 << 10 and seen[-1]
+        return wait_until(settled, "memory at rest")
+
+    def play(self, seed, end):
+        """One client after the other, each with messages as they come, until `end`; how many were open at once is one."""
+        r = random.Random(seed)
+        while time.monotonic() < end:
+            wire = Wire(self.root)
+            wire.socket.settimeout(15)
+            try:
+                wire.describe(r.choice((6, 7)), aggregates=r.random() < 0.3)
+                wire.call("startConfigWithCompletionHandler:")
+                for _ in range(r.choice((1, 10, 40))):
+                    self.say(wire, r)
+            except (OSError, plistlib.InvalidFileException):
+                pass  # shut out, or held back for too long: both are the daemon's right
+            finally:
+                wire.close()
+
+    def say(self, wire, r):
+        what = r.random()
+        try:
+            if what < 0.05:
+                wire.send(Wire.LARGE_CALL, {"op": LOG_DATA, "args": {"data": [b"d" * r.choice((9, 15 * MIB))]}}, 0)
+            elif what < 0.1:
+                wire.call("flushMessagesWithCompletion:") if r.random() < 0.5 else wire.send(
+                    Wire.CALL, {"op": "flushMessagesWithCompletion:", "args": {}})
+            elif what < 0.13:
+                wire.call("fetchStatesWithUserInfo:completionHandler:",
+                          userInfo={"clientName": "phone", "serviceName": "ringer", "more": r.choice(VALUES)(r)})
+            elif what < 0.15:
+                wire.raw(b"\0\x0f\xff\xff\2\0\0\0\0\0\0\1" + b"h" * r.choice((9, 900_000)))  # and no more
+                raise OSError
+            else:
+                wire.send(Wire.CALL, {"op": SEND, "args": {"category": r.choice((5, 6)), "type": 1,
+                                                           "payload": message(r)}})
+        except (plistlib.InvalidFileException, OverflowError, TypeError, ValueError):
+            pass  # a value that this writer cannot write
+
+    def attack(self, seconds, **storebags):
+        for name, content in storebags.items():
+            self.lab.put(name, content)
+        with self.serving("", env={"VELTRA_LOG": "error"}, serving=False) as daemon:
+            wait_until(lambda: pathlib.Path(self.root.socket).exists(), "the socket")
+            rest = self.at_rest(daemon)
+            for path, rule in (("/events", {"stall": True}), ("/realtime", {"delayMs": 3000}), ("/logdata", {"stall": True})):
+                self.lab.control(path=path, **rule)
+            end, most = time.monotonic() + seconds, 0
+            with concurrent.futures.ThreadPoolExecutor(CLIENTS) as pool:
+                playing = [pool.submit(self.play, seed, end) for seed in range(CLIENTS)]
+                while not all(one.done() for one in playing):
+                    most = max(most, self.resident(daemon))
+                    time.sleep(0.01)  # a sampling interval
+                for one in playing:
+                    one.result()
+            print(f"most {(most - rest) / MIB:.1f}"); self.assertLess(most - rest, 64 * MIB + CLIENTS * 40 * 1024, f"{(most - rest) / MIB:.1f} MiB above rest")
+            self.lab.reset()
+            wait_until(lambda: self.resident(daemon) - rest < 8 * MIB, "memory back", 75,
+                       lambda: f"{(self.resident(daemon) - rest) / MIB:.1f} MiB above rest")
+            print(f"most {(most - rest) / MIB:.1f} MiB above rest of {rest / MIB:.1f}")
+
+    def test_posting(self):
+        self.attack(8, quindle=storebag(), ostvane=storebag(sampling_threshold=0, override_sampling=1))
+
+
+if __name__ == "__main__":
+    unittest.main()
