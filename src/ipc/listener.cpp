@@ -24,19 +24,22 @@ using platform::FileDescriptor;
 
 // How long the accepting thread rests when the system has no descriptor or memory left.
 constexpr int kPauseMilliseconds = 100;
+// Whoever waits to be accepted is looked at with so many others.
+constexpr std::size_t kMostAtOnce = 64;
 
 // A copy of descriptor 0, which is always there: the sandbox lets nobody open a path for it.
 FileDescriptor openSpare() {
   return FileDescriptor(::fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 0));
 }
 
-std::string refusedPeer(const platform::Peer& peer, const std::string& entitlementsPath) {
+std::string refusedPeer(const platform::Peer& peer, const std::string& unit,
+                        const std::string& entitlementsPath) {
   return fmt::format(
       "Connection refused: this peer (uid {}, gid {}, unit {}) does not hold the entitlement \"{}\"; add a "
       "rule for it "
       "to {}.",
-      peer.uid, peer.gids.empty() ? std::string("unknown") : std::to_string(peer.gids.front()),
-      peer.unit.value_or("none"), kVeltraEntitlement, entitlementsPath);
+      peer.uid, peer.gids.empty() ? std::string("unknown") : std::to_string(peer.gids.front()), unit,
+      kVeltraEntitlement, entitlementsPath);
 }
 
 // A peer that gets no connection is told why all the same; its queue is empty, so this cannot block.
@@ -122,24 +125,61 @@ void Listener::acceptLoop() {
       Lock lock(_mutex);
       if (_stopping) return;
     }
-    if (watched[0].revents != 0) acceptOne();
+    if (watched[0].revents != 0) acceptSome();
   }
 }
 
-void Listener::acceptOne() {
+// Those whose user id alone refuses them come last, so that a user who is turned away as fast as he comes
+// holds nobody up.
+void Listener::acceptSome() {
+  std::vector<Arrived> arrived;
+  arrived.reserve(kMostAtOnce);
+  pollfd watched{_socket.listening(), POLLIN, 0};
+  do {
+    if (!acceptOne(arrived)) break;
+  } while (arrived.size() < kMostAtOnce && ::poll(&watched, 1, 0) > 0);
+  for (Arrived& one : arrived) {
+    if (one.refusal.empty()) admit(std::move(one.socket));
+  }
+  for (Arrived& one : arrived) {
+    if (one.socket.isOpen()) refuseSocket(std::move(one.socket), one.refusal);
+  }
+}
+
+// False: there is nobody more for now.
+bool Listener::acceptOne(std::vector<Arrived>& arrived) {
   FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
-  if (socket.isOpen()) return admit(std::move(socket));
+  if (socket.isOpen()) {
+    auto peer = platform::credentialsOfSocket(socket.get());
+    std::string refusal = peer ? refusalOf(peer.value()) : std::string();
+    arrived.push_back(
+        {std::move(socket), peer ? std::move(peer.value()) : platform::Peer{}, std::move(refusal)});
+    return true;
+  }
   switch (errno) {
     case EAGAIN:
     case EINTR:
     case ECONNABORTED:
-      return;
+      return false;
     case EMFILE:
     case ENFILE:
-      return acceptWithSpare(errno);
+      acceptWithSpare(errno);
+      return false;
     default:
-      return pause(errno);
+      pause(errno);
+      return false;
   }
+}
+
+// What can be said without looking up anything but the credentials.
+std::string Listener::refusalOf(const platform::Peer& peer) {
+  if (auto bound = boundReached(peer.uid)) return std::move(*bound);
+  if (_entitlements.mayHold(kVeltraEntitlement, peer.uid)) return {};
+  _counters.count("connection refused: the peer does not hold the entitlement");
+  logDebug(
+      "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
+      ipc::SocketConnection::describe(_nextNumber++, peer).c_str());
+  return refusedPeer(peer, "not looked up", _entitlementsPath);
 }
 
 // The table of descriptors is full: the spare one lets this client be told, and the queue move on.
@@ -238,7 +278,8 @@ void Listener::runConnection(std::uint64_t number, ipc::SocketConnection& connec
     connection.run();
   } else {
     _counters.count("connection refused: the peer does not hold the entitlement");
-    connection.refuse(refusedPeer(connection.peer(), _entitlementsPath));
+    connection.refuse(
+        refusedPeer(connection.peer(), connection.peer().unit.value_or("none"), _entitlementsPath));
   }
   Lock lock(_mutex);
   _finished.push_back(std::move(_clients[number].thread));

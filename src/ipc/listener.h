@@ -67,8 +67,15 @@ class Listener {
   };
 
   void acceptLoop();
-  void acceptOne();
+  struct Arrived {
+    platform::FileDescriptor socket;
+    platform::Peer peer;  // credentials alone
+    std::string refusal;  // empty: none that its user id tells
+  };
+  void acceptSome();
+  bool acceptOne(std::vector<Arrived>& arrived);
   void acceptWithSpare(int error);
+  std::string refusalOf(const platform::Peer& peer);
   void pause(int error);
   void warnOfAccept(int error);
   void admit(platform::FileDescriptor socket);

@@ -22,15 +22,15 @@ using Clock = std::chrono::steady_clock;
 constexpr std::chrono::seconds kLastWrites{1};
 constexpr const char* kDaemonVersion = "8.0";
 
-std::string describe(std::uint64_t number, const platform::Peer& peer) {
-  return fmt::format("connection {} (uid {}, pid {})", number, peer.uid, peer.pid);
-}
-
 }  // namespace
 
 std::string refusalFrame(const std::string& description) {
   return makeFrame(FrameKind::refusal, 0,
                    {{"error", dictionaryOfError(makeReportingError(description, -1))}});
+}
+
+std::string SocketConnection::describe(std::uint64_t number, const platform::Peer& peer) {
+  return fmt::format("connection {} (uid {}, pid {})", number, peer.uid, peer.pid);
 }
 
 SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,

@@ -39,6 +39,8 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   // The client's bytes end here: frames that came whole are run, up to `deadline`; then the connection ends.
   void stop(std::chrono::steady_clock::time_point deadline);
 
+  // "connection 12 (uid 0, pid 345)"
+  static std::string describe(std::uint64_t number, const platform::Peer& peer);
   std::string description() const override { return _description; }
   std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return _account; }
   std::optional<Value> valueForEntitlement(std::string_view name) override;

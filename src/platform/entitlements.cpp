@@ -108,6 +108,16 @@ std::optional<Value> entitlementInRules(const Array& rules, std::string_view nam
   return std::nullopt;
 }
 
+bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
+  return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
+    const Dictionary* rule = value.asDictionary();
+    const Value* wanted = rule ? rule->find("uid") : nullptr;
+    if (!rule || (wanted && idOf(*wanted) != uid)) return false;
+    const Dictionary* entitlements = rule->dictionary("entitlements");
+    return entitlements && entitlements->contains(name);
+  });
+}
+
 Entitlements::Entitlements(FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
 
 // Logged once the lock is released.
@@ -143,6 +153,23 @@ std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, co
     refresh(said);
     found = entitlementInRules(_rules, name, peer);
   }
+  say(said);
+  return found;
+}
+
+bool Entitlements::mayHold(std::string_view name, unsigned uid) {
+  Said said;
+  bool may = false;
+  {
+    Lock lock(_mutex);
+    refresh(said);
+    may = mayHoldByRules(_rules, name, uid);
+  }
+  say(said);
+  return may;
+}
+
+void Entitlements::say(const Said& said) {
   if (said.error) logError("Entitlements could not be read, nothing is granted: %s", said.error->c_str());
   for (const std::string& warning : said.warnings) logWarning("Entitlements: %s", warning.c_str());
   if (said.shortage) {
@@ -150,7 +177,6 @@ std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, co
                                           *said.shortage);
     if (line) logWarning("%s", line->c_str());
   }
-  return found;
 }
 
 }  // namespace veltrad::platform

@@ -24,10 +24,13 @@ class Entitlements {
   Entitlements(FileStore& files, std::string path);
   // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
+  // False: no rule grants it to this user, whatever groups and unit a process of his has.
+  bool mayHold(std::string_view name, unsigned uid);
 
  private:
   struct Said;
   void refresh(Said& said) REQUIRES(_mutex);
+  void say(const Said& said);
 
   FileStore& _files;
   const std::string _path;
@@ -38,7 +41,8 @@ class Entitlements {
   LimitedLine _shortages{"questions"};
 };
 
-// The decision alone; exposed for its table of tests.
+// The decisions alone; exposed for their tables of tests.
+bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid);
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
 
 }  // namespace veltrad::platform

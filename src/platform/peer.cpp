@@ -113,25 +113,32 @@ bool endsWith(std::string_view text, std::string_view end) {
 
 }  // namespace
 
-Result<Peer, std::string> peerOfSocket(int socket) {
+Result<Peer, std::string> credentialsOfSocket(int socket) {
   ucred credentials{};
   socklen_t length = sizeof credentials;
   if (::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &length) != 0) {
     return Failure{"the peer's credentials: " + std::generic_category().message(errno)};
   }
-  const auto groups = supplementaryGroups(socket);
-  if (!groups) return Failure{"the peer's groups: " + std::generic_category().message(groups.error())};
-
   Peer peer;
   peer.uid = credentials.uid;
   peer.gids.push_back(credentials.gid);
-  peer.gids.insert(peer.gids.end(), groups.value().begin(), groups.value().end());
   peer.pid = credentials.pid;
+  return peer;
+}
+
+Result<Peer, std::string> peerOfSocket(int socket) {
+  auto credentials = credentialsOfSocket(socket);
+  if (!credentials) return credentials;
+  const auto groups = supplementaryGroups(socket);
+  if (!groups) return Failure{"the peer's groups: " + std::generic_category().message(groups.error())};
+
+  Peer& peer = credentials.value();
+  peer.gids.insert(peer.gids.end(), groups.value().begin(), groups.value().end());
   Asked asked;
   peer.unit = unitOfPeer(socket, asked);
   if (asked.shortage != 0)
     return Failure{"the peer's unit: " + std::generic_category().message(asked.shortage)};
-  return peer;
+  return credentials;
 }
 
 bool kernelTellsUnits() {

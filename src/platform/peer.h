@@ -18,7 +18,9 @@ struct Peer {
   std::optional<std::string> unit;
 };
 
-// Fails also where the unit cannot be asked for just now, for want of a descriptor.
+// The peer's user, effective group and process alone: one question to the kernel.
+Result<Peer, std::string> credentialsOfSocket(int socket);
+// All of it. Fails also where the unit cannot be asked for just now, for want of a descriptor.
 Result<Peer, std::string> peerOfSocket(int socket);
 // False only on kernels that cannot say which unit a peer belongs to.
 bool kernelTellsUnits();

@@ -297,8 +297,8 @@ class Wire:
 
     def __init__(self, root, hello=True):
         self.socket = socket.socket(socket.AF_UNIX)
+        self.socket.connect(root.socket)  # waits where the queue is full
         self.socket.settimeout(DEADLINE)
-        self.socket.connect(root.socket)
         self._call, self._bytes = 0, b""
         if hello:
             self.send(self.HELLO, {"wire": 1, "library": "8.0"})

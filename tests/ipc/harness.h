@@ -3,10 +3,12 @@
 
 #include <gmock/gmock.h>
 
+#include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
 #include "fakes/wire.h"
 #include "ipc/listener.h"
+#include "protocol/constants.h"
 
 namespace veltrad::ipc_test {
 
@@ -73,6 +75,8 @@ class Door : public ListenerDelegate {
  public:
   explicit Door(std::size_t most = 4096, std::size_t mostOfOneUser = 1024, platform::MemoryBounds bounds = {})
       : memory(bounds) {
+    const Dictionary rule{{"uid", ::getuid()}, {"entitlements", Dictionary{{kVeltraEntitlement, true}}}};
+    _files.put("entitlements.plist", writeBinaryPropertyList(Array{rule}));
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
     _listener = std::make_unique<Listener>(
@@ -109,7 +113,7 @@ class Door : public ListenerDelegate {
 
  private:
   FakeFileStore _files;
-  platform::Entitlements _entitlements{_files, "entitlements.plist"};  // asked by nobody
+  platform::Entitlements _entitlements{_files, "entitlements.plist"};
   platform::LentFiles lentFiles;
   std::unique_ptr<Listener> _listener;
 };
