@@ -29,7 +29,8 @@ std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
                                        productFamily.value_or(""));
   }
   if (name == kVeltraBackendHTTPPost || name == kVeltraBackendHTTPPost2) {
-    return HTTPSPostBackend::initWithName(_services, name, profile.asDictionary(), productFamily);
+    return HTTPSPostBackend::initWithName(_services, _postErrors, name, profile.asDictionary(),
+                                          productFamily);
   }
   if (name == kVeltraBackendAmpery) {
     return AmperyBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""));

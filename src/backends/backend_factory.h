@@ -7,6 +7,7 @@
 
 #include "backends/backend.h"
 #include "backends/dashboard/log_data_uploads.h"
+#include "backends/https/post_errors.h"
 #include "backends/upload/file_uploads.h"
 
 namespace veltrad {
@@ -60,9 +61,12 @@ class StandardBackendFactory final : public BackendFactory {
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType) override;
+  // The lines that were held back: before the daemon ends.
+  void sayRest() { _postErrors.sayRest(); }
 
  private:
   const BackendServices _services;
+  PostErrors _postErrors;
   LogDataUploads _logData;
   FileUploads _files;
 };

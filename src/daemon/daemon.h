@@ -22,6 +22,7 @@ class Daemon {
  public:
   explicit Daemon(platform::Services& services);
   VeltradAgent& agent() { return _agent; }
+  StandardBackendFactory& backends() { return _factory; }
 
  private:
   Veltra _library;

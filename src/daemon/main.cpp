@@ -164,6 +164,7 @@ int main(int count, char** arguments) {
   serve(services, daemon.agent(), loop);
 
   const std::size_t stuck = stop(services, listener);
+  daemon.backends().sayRest();
   if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited
   services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
   if (stuck > 0) {

@@ -1,8 +1,10 @@
 // The HTTP client against the lab's real TLS server on loopback.
 #include "platform/http_client.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 
 #include <csignal>
 #include <future>
@@ -81,7 +83,9 @@ class HTTPClientTest : public testing::Test {
   std::future<HTTPResult> start(HTTPRequest request) {
     auto promise = std::make_shared<std::promise<HTTPResult>>();
     std::future<HTTPResult> future = promise->get_future();
-    client.start(std::move(request), [promise](HTTPResult result) { promise->set_value(std::move(result)); });
+    auto refusal = client.start(std::move(request),
+                                [promise](HTTPResult result) { promise->set_value(std::move(result)); });
+    if (refusal) promise->set_value(Failure{std::move(*refusal)});
     return future;
   }
 
@@ -91,11 +95,12 @@ class HTTPClientTest : public testing::Test {
   void SetUp() override { place.write("ca.pem", healthy.certificate()); }
 };
 
-#define EXPECT_TRANSPORT_ERROR(result, text)                                   \
+#define EXPECT_TRANSPORT_ERROR(result, text) EXPECT_ERROR(result, transport, text)
+#define EXPECT_ERROR(result, expected, text)                                   \
   do {                                                                         \
     const HTTPResult& r = (result);                                            \
     ASSERT_FALSE(r.ok());                                                      \
-    EXPECT_EQ(r.error().kind, HTTPError::Kind::transport);                     \
+    EXPECT_EQ(r.error().kind, HTTPError::Kind::expected);                      \
     EXPECT_THAT(r.error().description, text);                                  \
     EXPECT_THAT(r.error().description, Not(testing::ContainsRegex("[\r\n]"))); \
   } while (false)
@@ -126,24 +131,87 @@ TEST_F(HTTPClientTest, SendsExactlyWhatTheRequestSays) {
   EXPECT_EQ(*requests[1].dictionary("headers"), (Dictionary{{"Host", host}, {"Content-Length", "0"}}));
 }
 
-TEST_F(HTTPClientTest, BadAnswersEndWithOneLine) {
-  std::string headers = R"({"path": "/", "headers": {"X": "x")";
-  for (int i = 0; i < 30; ++i)
-    headers += ", \"X" + std::to_string(i) + "\": \"" + std::string(10'000, 'x') + '"';
-  headers += "}}";
-  const std::string body = R"("body": ")" + std::string(2000, 'x') + "\"}";
-  const std::tuple<std::string, std::size_t, const char*> cases[] = {
-      {R"({"path": "/", "endless": true})", 100'000, "The answer is larger than 100000 bytes"},
-      {R"({"path": "/", )" + body, 1000, "The answer is larger than 1000 bytes"},
-      {headers, 100'000, "The answer is larger than 100000 bytes"},
-      {headers, 16u << 20, "The answer's headers are larger than 262144 bytes"},
-      {kStall, 1000, "time"}};
-  for (const auto& [rule, most, text] : cases) {
+TEST_F(HTTPClientTest, AnswersAreBounded) {
+  const auto withHeaders = [](int count, std::size_t length) {
+    std::string rule = R"({"path": "/", "status": 503, "body": "short", "headers": {"X": "x")";
+    for (int i = 0; i < count; ++i)
+      rule += ", \"X" + std::to_string(i) + "\": \"" + std::string(length, 'x') + '"';
+    return rule + "}}";
+  };
+  const std::string endless = R"({"path": "/", "status": 503, "endless": true})";
+  const std::string large = R"({"path": "/", "status": 503, "body": ")" + std::string(2000, 'x') + "\"}";
+  constexpr std::size_t kMost = 16u << 20;
+  // Kept or thrown away; the error, if it is one.
+  const std::tuple<std::string, std::size_t, bool, std::optional<HTTPError::Kind>, const char*> cases[] = {
+      {endless, kMost, true, HTTPError::Kind::tooLarge, "The answer is larger than 16777216 bytes"},
+      {endless, kMost, false, std::nullopt, ""},
+      {large, 1000, true, HTTPError::Kind::tooLarge, "The answer is larger than 1000 bytes"},
+      {large, 1000, false, std::nullopt, ""},
+      {withHeaders(6, 10'000), kMost, true, std::nullopt, "short"},
+      {withHeaders(7, 10'000), kMost, true, HTTPError::Kind::transport, "headers are over 65536 bytes"},
+      {withHeaders(200, 10), kMost, true, std::nullopt, "short"},
+      {withHeaders(10'000, 10), kMost, false, HTTPError::Kind::transport, "65536 bytes or 256 lines"},
+      {withHeaders(300, 10), kMost, true, HTTPError::Kind::transport, "65536 bytes or 256 lines"}};
+  for (const auto& [rule, most, keeps, kind, text] : cases) {
     const Server server({rule.c_str()});
-    HTTPRequest request = get(server.url("/x"));
+    HTTPRequest request = post(server.url("/x"), "{}");
     request.mostResponseBytes = most;
-    if (rule == kStall) request.timeout = 300ms;
-    EXPECT_TRANSPORT_ERROR(client.perform(std::move(request)), HasSubstr(text));
+    request.keepsAnswer = keeps;
+    const HTTPResult result = client.perform(std::move(request));
+    ASSERT_EQ(result.ok(), !kind) << text << rule.substr(0, 80);
+    EXPECT_EQ(result.ok() ? result.value().status : result.error().status, 503);
+    if (kind) EXPECT_EQ(result.error().kind, *kind);
+    EXPECT_THAT(result.ok() ? result.value().body : result.error().description, HasSubstr(text));
+    if (result.ok()) EXPECT_EQ(result.value().header("x0").has_value(), keeps);
+    if (!keeps && result.ok()) EXPECT_EQ(result.value().body, "");
+  }
+  HTTPRequest late = get(hung.url("/x"));
+  late.timeout = 300ms;
+  EXPECT_TRANSPORT_ERROR(client.perform(std::move(late)), HasSubstr("time"));
+}
+
+TEST_F(HTTPClientTest, ABodyIsReadFromItsFile) {
+  std::string text(5u << 20, '"');
+  for (std::size_t i = 1; i + 1 < text.size(); ++i) text[i] = static_cast<char>('a' + (i * i / 7) % 26);
+  place.write("body", text);
+  HTTPRequest request = post(healthy.url("/x"), "");
+  request.fileBody = FileBody{
+      std::make_shared<FileDescriptor>(open(place.path("body").c_str(), O_RDONLY | O_CLOEXEC)), text.size()};
+  HTTPRequest longer = post(healthy.url("/x"), "");
+  longer.fileBody = FileBody{request.fileBody->file, text.size() + 1};
+  ASSERT_TRUE(client.perform(post(healthy.url(), "0")).ok());  // the file goes over a kept connection
+  ASSERT_TRUE(client.perform(std::move(request)).ok());
+  EXPECT_TRANSPORT_ERROR(client.perform(std::move(longer)), HasSubstr("cannot be read as far as it should"));
+  ASSERT_EQ(healthy.requests().size(), 2u);
+  EXPECT_TRUE(*healthy.requests()[1].string("body") == text.substr(1, text.size() - 2));
+}
+
+// Lets `free` further descriptors be opened until it goes.
+class FewDescriptors {
+ public:
+  explicit FewDescriptors(unsigned free) {
+    getrlimit(RLIMIT_NOFILE, &_before);
+    FileDescriptor next[4];
+    for (FileDescriptor& one : next) one.reset(dup(STDIN_FILENO));
+    const rlimit few{static_cast<rlim_t>(next[free].get()), _before.rlim_max};
+    setrlimit(RLIMIT_NOFILE, &few);
+  }
+  ~FewDescriptors() { setrlimit(RLIMIT_NOFILE, &_before); }
+
+ private:
+  rlimit _before{};
+};
+
+TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
+  for (const bool started : {false, true}) {  // the HTTP thread
+    for (const unsigned free : {0u, 2u}) {
+      const FewDescriptors few(free);
+      EXPECT_ERROR(client.perform(get("https://name.invalid/")), shortage, Not(testing::IsEmpty()));
+      if (free > 0) continue;
+      EXPECT_ERROR(client.perform(get(hung.url())), shortage, Not(testing::IsEmpty()));
+      EXPECT_EQ(client.start(get(hung.url()), [](HTTPResult) {}).has_value(), !started);
+    }
+    EXPECT_TRUE(client.perform(post(healthy.url(), "1")).ok());
   }
 }
 
@@ -163,29 +231,34 @@ TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {
 
 TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
   std::atomic<int> stopped{0};
-  const auto countStopped = [&](HTTPResult result) {
-    if (!result.ok() && result.error().kind == HTTPError::Kind::stopping) ++stopped;
-  };
-  for (int i = 0; i < 1024; ++i) client.start(post(hung.url(), "x"), countStopped);
-  const HTTPResult refused = start(post(healthy.url(), "y")).get();
-  ASSERT_FALSE(refused.ok());
-  EXPECT_EQ(refused.error().kind, HTTPError::Kind::tooMany);
-  EXPECT_EQ(refused.error().description, "Too many posts under way");
+  MemoryBudget budget;
+  const auto account = budget.accountOf(1);
+  for (int i = 0; i < 1024; ++i) {
+    HTTPRequest request = post(hung.url(), "x");
+    request.charge = *account->keep(1000);
+    const auto refusal = client.start(std::move(request), [&](HTTPResult result) {
+      EXPECT_GE(account->used(), 1000u);  // its own is paid back later
+      if (!result.ok() && result.error().kind == HTTPError::Kind::stopping) ++stopped;
+    });
+    EXPECT_FALSE(refusal);
+  }
+  HTTPRequest one = post(healthy.url(), "y");
+  one.charge = *account->keep(1000);
+  const auto refused = client.start(std::move(one), [](HTTPResult) { ADD_FAILURE(); });
+  ASSERT_TRUE(refused);
+  EXPECT_EQ(refused->kind, HTTPError::Kind::tooMany);
+  EXPECT_EQ(refused->description, "Too many posts under way");
   EXPECT_EQ(client.underWay(), 1024u);
+  EXPECT_EQ(account->used(), 1'024'000u);
 
   ASSERT_TRUE(hung.waitForRequests(6));
   EXPECT_TRUE(client.perform(get(healthy.url("/x"), HTTPRequest::Lane::storebag)).ok());
   client.drain(std::chrono::steady_clock::now());
   EXPECT_EQ(stopped, 1024);
   EXPECT_EQ(client.underWay(), 0u);
+  EXPECT_EQ(account->used(), 0u);
   EXPECT_LE(hung.requests().size(), 8u);
   EXPECT_EQ(start(get(healthy.url())).get().error().kind, HTTPError::Kind::stopping);
-}
-
-TEST_F(HTTPClientTest, EventBodiesAreBoundedInAll) {
-  auto first = start(post(hung.url(), std::string(40u << 20, 'x')));
-  const HTTPResult second = start(post(hung.url(), std::string(25u << 20, 'x'))).get();
-  EXPECT_EQ(second.error().kind, HTTPError::Kind::tooMany);
 }
 
 TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOut) {
@@ -201,19 +274,29 @@ TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOu
   EXPECT_TRUE(hung.waitForRequests(7));  // it reached even the host that hangs
 }
 
-TEST_F(HTTPClientTest, UploadsRunTwoAtATime) {
-  std::vector<std::future<HTTPResult>> uploads;
-  for (const Server* server : {&healthy, &hung}) {
+TEST_F(HTTPClientTest, UploadsKeepNeitherLogDataNorPostsWaiting) {
+  const Server slow({R"({"path": "/slow", "stall": true})"});
+  std::vector<std::future<HTTPResult>> uploads, late;
+  for (const char* path : {"/", "/slow"}) {
     for (int i = 0; i < 6; ++i) {
-      HTTPRequest request = post(server->url(), std::string(200'000, 'u'), HTTPRequest::Lane::upload);
+      HTTPRequest request = post(slow.url(path), std::string(200'000, 'u'), HTTPRequest::Lane::upload);
       request.leastBytesPerSecond = 1024;
       uploads.push_back(start(std::move(request)));
     }
   }
   for (std::size_t i = 0; i < 6; ++i) EXPECT_TRUE(uploads[i].get().ok());
-  ASSERT_TRUE(hung.waitForRequests(2));
-  EXPECT_TRUE(client.perform(get(healthy.url("/x"))).ok());  // what would have come has come before this
-  EXPECT_EQ(hung.requests().size(), 2u);
+  ASSERT_TRUE(slow.waitForRequests(9));
+  EXPECT_TRUE(client.perform(post(slow.url(), "1")).ok());
+  EXPECT_TRUE(client.perform(post(slow.url(), "2", HTTPRequest::Lane::logData)).ok());
+  EXPECT_EQ(slow.requests().size(), 11u);  // three uploads of those that hang
+  // The time of the fourth begins when the first three have used up theirs.
+  for (const Server* server : {&hung, &hung, &hung, &healthy}) {
+    HTTPRequest request = post(server->url(), "3", HTTPRequest::Lane::logData);
+    request.timeout = 400ms;
+    late.push_back(start(std::move(request)));
+  }
+  EXPECT_TRUE(late[3].get().ok());
+  EXPECT_FALSE(late[0].get().ok());
 }
 
 TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
@@ -221,9 +304,9 @@ TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
   {
     CurlHTTPClient mine({place.path("ca.pem")});
     for (int i = 0; i < 10; ++i) {
-      mine.start(post(hung.url(), "x"), [&](HTTPResult) {
+      (void)mine.start(post(hung.url(), "x"), [&](HTTPResult) {
         ++first;
-        mine.start(post(hung.url(), "again"), [&](HTTPResult result) {
+        (void)mine.start(post(hung.url(), "again"), [&](HTTPResult result) {
           if (result.error().kind == HTTPError::Kind::stopping) ++second;
         });
       });
@@ -237,7 +320,7 @@ TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
 TEST_F(HTTPClientTest, AnEmptyTaskPassesUnlessACompletionHoldsTheThread) {
   EXPECT_TRUE(client.passesEmptyTask(0ms));  // no thread yet
   std::promise<void> entered, leave;
-  client.start(get("http://refused/"), [&](HTTPResult) {
+  (void)client.start(get("http://refused/"), [&](HTTPResult) {
     entered.set_value();
     leave.get_future().wait();
   });

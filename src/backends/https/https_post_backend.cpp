@@ -275,7 +275,8 @@ std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTT
   std::optional<ReportingError> error;
   if (!result.ok()) {
     const std::string& description = result.error().description;
-    logError("HTTPSPostBackend(postJsonMessage): post error: %s (%s)", description.c_str(), url.c_str());
+    _errors.happened(description);
+    logDebug("HTTPSPostBackend(postJsonMessage): posted to %s", url.c_str());
     error = makeReportingError(description, -1);
   }
   const int status = result.ok() ? result.value().status : result.error().status;

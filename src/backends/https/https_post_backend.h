@@ -11,6 +11,7 @@
 #include "backends/https/client_decision.h"
 #include "backends/https/filter_table.h"
 #include "backends/https/held_events.h"
+#include "backends/https/post_errors.h"
 #include "backends/https/post_request.h"
 
 namespace veltrad {
@@ -18,7 +19,7 @@ namespace veltrad {
 class HTTPSPostBackend final : public VeltraBackend {
  public:
   // Null without a profile, a product family or the profile's "clients" (one error line).
-  static std::shared_ptr<HTTPSPostBackend> initWithName(const BackendServices& services,
+  static std::shared_ptr<HTTPSPostBackend> initWithName(const BackendServices& services, PostErrors& errors,
                                                         const std::string& name, const Dictionary* profile,
                                                         const std::optional<std::string>& productFamily);
 
@@ -33,8 +34,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   const std::optional<std::string>& postURL() const { return _postURL; }
 
  private:
-  HTTPSPostBackend(const BackendServices& services, const std::string& name, const Dictionary& profile,
-                   const std::string& productFamily);
+  HTTPSPostBackend(const BackendServices& services, PostErrors& errors, const std::string& name,
+                   const Dictionary& profile, const std::string& productFamily);
 
   std::int32_t updateBackendState();
   void applyExpedite(const Dictionary& entry);
@@ -74,6 +75,7 @@ class HTTPSPostBackend final : public VeltraBackend {
 
   // Constant after construction.
   const BackendServices _services;
+  PostErrors& _errors;
   const bool _dnuEnabled;
   const bool _forceEventLogging;
   const std::string _uuidRespectDnu;

@@ -34,14 +34,15 @@ bool textMeansYes(const std::optional<std::string>& text) {
 }
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
-    const BackendServices& services, const std::string& name, const Dictionary* profile,
+    const BackendServices& services, PostErrors& errors, const std::string& name, const Dictionary* profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
   if (!profile->array("clients")) {
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(services, name, *profile, *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(
+      new HTTPSPostBackend(services, errors, name, *profile, *productFamily));
   if (made->_uuidRespectDnu.empty() || made->_uuidOverrideDnu.empty()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -49,10 +50,12 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
   return made;
 }
 
-HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, const std::string& name,
-                                   const Dictionary& profile, const std::string& productFamily)
+HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, PostErrors& errors,
+                                   const std::string& name, const Dictionary& profile,
+                                   const std::string& productFamily)
     : VeltraBackend(name, profile, productFamily, services.random),
       _services(services),
+      _errors(errors),
       _dnuEnabled(diagnosticLogSubmissionEnabled(services.preferences)),
       _forceEventLogging(
           textMeansYes(services.preferences.text(platform::kVeltraPreferenceDomain, "forceEventLogging"))),
