@@ -19,6 +19,8 @@ if(VELTRA_FUZZ)
   target_compile_options(veltra_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 target_link_libraries(veltra_options INTERFACE Threads::Threads)
+# A program loads only the libraries that it uses itself, not all that its rooms could use.
+target_link_options(veltra_options INTERFACE -Wl,--as-needed)
 
 # veltra_room(NAME [PUBLIC libs…] [PRIVATE libs…] [EXCLUDE regex]): the sources are every .cpp under the folder.
 function(veltra_room name)
