@@ -1,11 +1,16 @@
-// What real processes do not show of uploads: how far a file is read that changes meanwhile.
+// What real processes do not show of uploads: how far a file is read that changes meanwhile, and who gets the
+// next place.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <fstream>
+#include <memory>
+#include <thread>
 
 #include "backends/upload/file_snapshot.h"
+#include "backends/upload/file_uploads.h"
 #include "fakes/temporary_directory.h"
 #include "platform/file_descriptor.h"
 
@@ -31,9 +36,58 @@ TEST(FileSnapshot, EndsWhereTheFileEndedAtFirst) {
   auto shrunk = FileSnapshot::of(file.get());
   ASSERT_EQ(::ftruncate(file.get(), 6), 0);
   EXPECT_TRUE(readAll(*shrunk) == "012345" && shrunk->changed());
+  // Short for a while only, which nobody but the reader has seen.
+  auto cut = FileSnapshot::of(file.get());
+  struct stat facts {};
+  ASSERT_TRUE(::fstat(file.get(), &facts) == 0 && ::ftruncate(file.get(), 3) == 0);
+  EXPECT_EQ(readAll(*cut), "012");
+  const timespec times[] = {facts.st_atim, facts.st_mtim};
+  ASSERT_TRUE(::ftruncate(file.get(), facts.st_size) == 0 && ::futimens(file.get(), times) == 0);
+  EXPECT_TRUE(cut->changed());
   auto emptied = FileSnapshot::of(file.get());
   ASSERT_EQ(::ftruncate(file.get(), 0), 0);
   EXPECT_EQ(emptied->content(), FileSnapshot::Content::none);
+}
+
+// Asked by each who waits, after he has taken his place in the row.
+struct Stoppable final : platform::HTTPClient {
+  std::optional<platform::HTTPError> start(platform::HTTPRequest, platform::HTTPCompletion) override {
+    return std::nullopt;
+  }
+  platform::HTTPResult perform(platform::HTTPRequest) override { return Failure{platform::HTTPError{}}; }
+  bool stopping() const override {
+    ++asked;
+    return stop;
+  }
+  mutable std::atomic<int> asked{0};
+  std::atomic<bool> stop{false};
+};
+
+// Who waits is let in by order of arrival, but for the share of his user; a stop ends every wait.
+TEST(FileUploads, OneUserLeavesAPlaceToOthers) {
+  FileUploads uploads;
+  Stoppable http;
+  using Place = std::optional<FileUploads::Place>;
+  auto first = std::make_unique<Place>(uploads.enter(1, http));
+  const Place second = uploads.enter(1, http);
+  std::atomic<bool> entered{false}, turnedAway{false};
+  const auto wait = [&](std::atomic<bool>& result, bool wanted) {
+    return std::thread([&, wanted] { result = uploads.enter(1, http).has_value() == wanted; });
+  };
+  std::thread third = wait(entered, true);
+  while (http.asked < 3) std::this_thread::yield();
+  const Place other = uploads.enter(2, http);  // not behind the one who waits for himself
+  EXPECT_TRUE(other && !entered);
+  first.reset();
+  third.join();
+  EXPECT_TRUE(entered);
+  const Place anonymous = uploads.enter(std::nullopt, http);  // all three are taken
+  http.asked = 0;
+  std::thread late = wait(turnedAway, false);
+  while (http.asked < 1) std::this_thread::yield();
+  http.stop = true;
+  late.join();
+  EXPECT_TRUE(turnedAway);
 }
 
 }  // namespace
