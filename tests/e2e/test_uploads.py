@@ -2,10 +2,16 @@
 import hashlib
 import json
 import os
+import resource
 import socket
+import struct
 import subprocess
+import sys
+import threading
+import unittest
 
 from harness import DEVICE, SystemTest, Wire, closed_port, program, storebag, wait_until
+from served import FLUSH, GETATTR, READ, Served
 
 OP = "uploadFileAtPath:extensionToken:completionHandler:"
 REGULAR, EMPTY = "Only upload a regular file.", "Input file is empty"
@@ -44,8 +50,18 @@ class Uploads(SystemTest):
     def descriptors(self, process):
         return len(os.listdir(f"/proc/{process.popen.pid}/fd"))
 
+    def fates(self):
+        """What the run that has ended counted of files."""
+        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]
+        return {key: count for key, count in counts.items() if key.startswith("file ")}
+
+    def fates(self):
+        """What the run that has ended counted of files."""
+        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]
+        return {key: count for key, count in counts.items() if key.startswith("file ")}
+
     def test_request_and_its_file(self):
-        content = os.urandom(5 << 20)  # enough for two threads
+        content = os.urandom(1 << 20)  # too much to stay in memory
         names = ["a b.log", "50%&x=1#ü.txt", b"\xff.log", "-"]
         with self.serving() as daemon:
             for name in names:
@@ -93,8 +109,7 @@ class Uploads(SystemTest):
                     seen.append(line)
                     daemon.wait_for_line(line, seen.count(line))
             daemon.wait_for_line("File upload failed for", len(kinds))
-        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]  # of the run that has ended
-        self.assertEqual({key: count for key, count in counts.items() if "file " in key},
+        self.assertEqual(self.fates(),
                          {"file refused: nothing lent, or no regular file": 8, "file refused: too large": 1,
                           "file refused: empty or unreadable": 1})
         self.assertTrue(os.path.exists(real))
@@ -149,6 +164,12 @@ class Uploads(SystemTest):
                     self.assertIn("and removed" if removed else "has not confirmed it", said)
                     self.assertEqual(os.path.exists(path), not removed)
                     daemon.wait_for_line("UploadBackend(uploadFileAtPath): " * line.startswith("post") + line)
+        self.assertEqual(self.fates(), {"file uploaded": 1, "file not confirmed": 3,
+                                        "file confirmed: its removal was asked for": 1,
+                                        "file lost: the exchange with the server failed": 2})
+        self.assertEqual(self.fates(), {"file uploaded": 1, "file not confirmed": 3,
+                                        "file confirmed: its removal was asked for": 1,
+                                        "file lost: the exchange with the server failed": 2})
 
     def test_addresses(self):
         for url, status, line in [(f"https://localhost:{closed_port()}/", 0, "post Failed to connect"),
@@ -206,3 +227,127 @@ class Uploads(SystemTest):
             self.lab.received("uploads", 2)
         self.assertEqual(sorted(session.answer()["uploaded"] for session in sessions), [False, False, True, True])
         self.assertEqual(len(os.listdir(self.files)), 4)
+        self.assertEqual(self.fates(), {"file lost: the daemon is stopping": 4})
+
+    def test_memory_and_room(self):
+        """A large file that does not compress costs no memory; what it costs of the disk goes with it."""
+        path = self.make("noise", os.urandom(64 << 20))
+        scratch = self.root.path / "var/lib/veltrad/preferences"
+        with self.serving("No room for the compressed bytes", "File upload failed") as daemon:
+            def memory(key):
+                with open(f"/proc/{daemon.popen.pid}/status") as status:
+                    return int(next(line.split()[1] for line in status if line.startswith(key))) >> 10
+            self.upload(self.make("first"))
+            before, files = memory("VmRSS"), os.listdir(scratch)
+            self.upload(path)
+            self.assertLess(memory("VmHWM"), before + 8)
+            resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE, (1 << 20,) * 2)
+            path = self.make("noise", os.urandom(2 << 20))
+            self.upload(path, status=1)
+            daemon.wait_for_line(f"No room for the compressed bytes of {os.fsdecode(path)} in {scratch}: File too large")
+            self.assertEqual(os.listdir(scratch), files)
+        self.assertTrue(os.path.exists(path))
+        self.assertEqual(self.fates(), {"file uploaded": 2, "file confirmed: its removal was asked for": 2,
+                                        "file lost: no room for its compressed bytes": 1})
+
+    @unittest.skipUnless(os.getuid() == 0, "needs a second user")
+    def test_places(self):
+        """Two uploads of one user that hang, and a third that waits, leave a place to another user."""
+        self.root.path.chmod(0o755)
+        self.root.grant([{"uid": uid, "entitlements": {"com.florn.private.veltrad": True}} for uid in (0, 65534)])
+        with self.serving("The daemon is stopping", "File upload failed"):
+            self.lab.control(path="/upload", stall=True)
+            held = [self.open(session_id=number)[0] for number in range(3)]
+            for number, session in enumerate(held):
+                session.say(op="uploadFile", path=os.fsdecode(self.make(str(number))))
+            self.lab.received("uploads", 2)
+            other = subprocess.Popen([program("veltractl"), "upload", "--client-type", "7", self.make("other")],
+                                     env=self.root.environment(), stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL,
+                                     user=65534)
+            names = [line["query"]["filename"] for line in self.lab.received("uploads", 3)]
+        self.assertEqual(names[2], "other.gz")
+        other.wait()
+
+    def test_files_that_are_swapped(self):
+        """Somebody exchanges the path's file with another one all the while: only what was uploaded ever goes."""
+        path, spare = os.fsdecode(self.files / "log"), os.fsdecode(self.files / "spare")
+        swapper = subprocess.Popen([sys.executable, "-c", "import ctypes, sys; a, b = map(str.encode, sys.argv[1:]); "
+                                    "libc = ctypes.CDLL(None)\nwhile True: libc.renameat2(-100, a, -100, b, 2)", path, spare])
+        self.addCleanup(swapper.kill)
+        removed = 0
+        with self.serving(CHANGED):
+            session, _ = self.open()
+            for number in range(150):
+                held = {}
+                for place in (path, spare):
+                    content = f"{place} {number}".encode()
+                    descriptor = os.open(place, os.O_RDWR | os.O_CREAT | os.O_EXCL)
+                    os.write(descriptor, content)
+                    held[hashlib.sha256(content).hexdigest()] = descriptor
+                self.assertTrue(session.ask("uploadFile", path=path)["uploaded"])
+                uploaded = self.lab.received("uploads", number + 1)[-1]["plainSHA256"]
+                for digest, descriptor in held.items():
+                    gone = os.fstat(descriptor).st_nlink == 0
+                    removed += gone
+                    self.assertTrue(digest == uploaded or not gone, f"round {number}: the other file is gone")
+                    os.close(descriptor)
+                wait_until(self.clear, "an empty directory")
+        swapper.kill()
+        swapper.wait()
+        self.assertGreater(removed, 0)
+
+    def clear(self):
+        """Whether all files are removed, which the swapper may move meanwhile."""
+        for left in os.listdir(self.files):
+            try:
+                os.unlink(self.files / left)
+            except FileNotFoundError:
+                pass
+        return not os.listdir(self.files)
+
+    @unittest.skipUnless(os.getuid() == 0 and os.path.exists("/dev/fuse"), "needs the right to mount")
+    def test_files_that_others_serve(self):
+        """The daemon asks nobody's file server; the library lends a copy. A mount namespace of one's own is no matter."""
+        place = self.root.path / "served"
+        place.mkdir()
+        served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})
+        self.addCleanup(served.end)
+        with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon:
+            client = Wire(self.root)
+            client.describe()
+            client.call("startConfigWithCompletionHandler:")
+            hanging = os.open(place / "hangs", os.O_RDONLY)
+            served.silent, asked = (READ, GETATTR), len(served.asked)
+            for _ in range(4):
+                self.assertEqual(self.lend(client, hanging)[-1][2], {"results": {"uploaded": False}})
+            daemon.wait_for_line("/x/lent.log lies on a file system of type fuse.served, whose reads may never end", 4)
+            self.assertLessEqual(set(served.asked[asked:]), {FLUSH})
+            served.silent = ()
+            os.close(hanging)
+            for name in ("small", "large"):
+                self.assertIn("Uploaded and removed", self.upload(os.fsencode(place / name))[1])
+            self.assertEqual(list(served.nodes), [b"hangs"])
+            path = self.make()
+            subprocess.run(["unshare", "-m", program("veltractl"), "upload", "--client-type", "7", path], check=True,
+                           env=self.root.environment(), stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+            digests = [line["plainSHA256"] for line in self.lab.received("uploads", 3)]
+        self.assertEqual(digests[:2], [hashlib.sha256(content).hexdigest() for content in (b"served", bytes(9 << 20))])
+        self.assertEqual(self.fates(), {"file refused: others serve its file system": 4, "file uploaded": 3,
+                                        "file confirmed: its removal was asked for": 3})
+
+    def test_clients_that_lend_their_own_end(self):
+        """In a frame that they never finish: the connection ends with the client all the same."""
+        with self.serving() as daemon:
+            def held():
+                return self.descriptors(daemon), len(os.listdir(f"/proc/{daemon.popen.pid}/task"))
+            keeper = Wire(self.root)
+            before = held()
+            clients = [Wire(self.root) for _ in range(200)]
+            for client in clients:
+                client.raw(struct.pack(">IBBHI", 1000, Wire.CALL, 1, 0, 1) + b"unfinished", [client.socket.fileno()])
+            wait_until(lambda: held()[1] >= before[1] + 200, "200 connections")
+            for client in clients:
+                client.close()
+            wait_until(lambda: held() <= before, f"back to {before}", also=held)
+            keeper.close()
+
