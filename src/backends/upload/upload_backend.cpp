@@ -32,6 +32,8 @@ const char* fateAfter(platform::HTTPError::Kind kind) {
     case platform::HTTPError::Kind::transport:
     case platform::HTTPError::Kind::tooLarge:
       return "file lost: the exchange with the server failed";
+    case platform::HTTPError::Kind::tooLarge:
+      return "file lost: the server's answer is too large";
     case platform::HTTPError::Kind::tooMany:
     case platform::HTTPError::Kind::shortage:
       return "file lost: no exchange could begin for a shortage";
