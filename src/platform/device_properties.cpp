@@ -75,17 +75,11 @@ DeviceProperty MachineProperties::fromMachine(std::string_view key) {
   MachineFacts machine(_files);
   auto fact = factOf(machine, key);
   const Lock lock(_mutex);
+  if (!machine.shortage())
+    return _lastFacts.insert_or_assign(std::string(key), std::move(fact)).first->second;
   const auto last = _lastFacts.find(key);
-  if (machine.shortage()) {
-    if (last == _lastFacts.end()) return Failure{*machine.shortage()};
-    return last->second;
-  }
-  if (last != _lastFacts.end()) {
-    last->second = fact;
-  } else if (fact) {
-    _lastFacts.emplace(key, fact);
-  }
-  return fact;
+  if (last == _lastFacts.end()) return Failure{*machine.shortage()};
+  return last->second;
 }
 
 }  // namespace veltrad::platform

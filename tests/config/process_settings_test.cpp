@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <functional>
 #include <thread>
 
 #include "configuration.h"
@@ -77,6 +78,31 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
     machine.preferences.set("veltra_storebag_url", "https://later.test");
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
+  }
+}
+
+TEST(ProcessSettings, AreNothingDuringAShortageAndRightAfterIt) {
+  const std::string path = platform::Root("/").deploymentPath();
+  const ExpectedLog log({});
+  Machine machine(true, "", {});
+  machine.files.put(path, writeXMLPropertyList(Dictionary{{"internalStorebagHost", "in.test"}}));
+  const std::function<void(bool)> shortages[] = {[&](bool on) { machine.preferences.runShort(on); },
+                                                 [&](bool on) { machine.properties.runShort(on); },
+                                                 [&](bool on) { machine.files.runShort(on); }};
+  for (const auto& runShort : shortages) {
+    DeviceIdentity device(machine.properties);
+    ProcessSettings fresh(machine.preferences, device, machine.files, path);
+    runShort(true);
+    EXPECT_EQ(fresh.storebagServerURL(), std::nullopt);
+    const auto environment = fresh.currentEnvironment();
+    EXPECT_TRUE(!environment || *environment == 2);
+    runShort(false);
+    EXPECT_EQ(fresh.currentEnvironment(), 2u);
+    EXPECT_EQ(fresh.storebagServerURL(), "https://in.test/storebags/maple");
+    runShort(true);
+    EXPECT_EQ(fresh.currentEnvironment(), 2u);
+    EXPECT_EQ(fresh.storebagServerURL(), "https://in.test/storebags/maple");
+    runShort(false);
   }
 }
 

@@ -90,6 +90,44 @@ TEST(StorebagDownload, FallsBackForQuindleAloneWhenTheServerIsUnreachable) {
   EXPECT_EQ(quindle.maxAge, kUntouched);
 }
 
+TEST(StorebagDownload, IsNoAttemptForAShortageOrAStop) {
+  using Kind = platform::HTTPError::Kind;
+  const struct {
+    Kind kind;
+    bool attempted, standsIn;
+    Lines lines;
+  } table[] = {{Kind::shortage, false, true, {}},
+               {Kind::stopping, false, false, {}},
+               {Kind::tooLarge, true, false, {kNoList, kMissing}},
+               {Kind::transport, true, true, {}}};
+  for (const auto& c : table) {
+    Configuration configuration;
+    configuration.answer = Failure{platform::HTTPError{c.kind, "why", 200}};
+    const Fetch quindle(configuration, c.lines, kMonday, "quindle"), other(configuration, c.lines, kMonday);
+    EXPECT_EQ(quindle.attempted, c.attempted);
+    EXPECT_EQ(quindle.storebag.has_value(), c.standsIn);
+    EXPECT_EQ(other.attempted, c.attempted);
+    EXPECT_EQ(other.storebag, std::nullopt);
+    EXPECT_EQ(other.lastModified, kMonday);
+  }
+  // What is read before and after the exchange.
+  Configuration configuration;
+  configuration.answers(container(writeXMLPropertyList(kStorebag)));
+  configuration.preferences.runShort(true);
+  EXPECT_FALSE(Fetch(configuration).attempted);
+  configuration.preferences.runShort(false);
+  for (const std::string& path :
+       {configuration.root.packageManifestPath(), configuration.root.publicKeyPath()}) {
+    configuration.files.failReads(path, FakeFileStore::Kind::shortage);
+    const Fetch fetch(configuration);
+    EXPECT_FALSE(fetch.attempted) << path;
+    EXPECT_EQ(fetch.storebag, std::nullopt);
+    configuration.files.failReads(path, {});
+  }
+  EXPECT_EQ(configuration.requests.size(), 1u);
+  EXPECT_EQ(Fetch(configuration).storebag, kStorebag);
+}
+
 TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
   const std::string bag = writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
   const std::string signature = encodeBase64(RSAKey::shared().sign(bag));

@@ -175,6 +175,36 @@ TEST_F(Agent, AnEmptiedListStaysAndALeavingSessionIsForgotten) {
   EXPECT_EQ(agent.userInfoKeyCount(), 2u);
 }
 
+// Nothing is recorded, so the next session asks again at once.
+TEST_F(Agent, ADownloadThatWasNoAttemptLeavesTheRecordAsItWas) {
+  const auto client = connect(7);
+  source.attempts = false;
+  const Dictionary standsIn{{"mivo", Dictionary{}}};
+  source.section = std::nullopt;
+  EXPECT_EQ(ask(client), nullptr);
+  source.section = standsIn;
+  EXPECT_EQ(*ask(client), standsIn);
+  EXPECT_EQ(agent.storebagVersionForSession(sessionOf(client)), std::nullopt);
+  source.attempts = true;
+  const Dictionary kept{{"httppost", Dictionary{}}};
+  source.section = kept;
+  source.age = 100;
+  EXPECT_EQ(*ask(client), kept);
+  EXPECT_EQ(source.fetches, 3);
+  world.clock.advance(101);
+  source.attempts = false;
+  source.newLastModified = "later";
+  for (const auto& section : {std::optional(standsIn), std::optional<Dictionary>()}) {
+    source.section = section;
+    EXPECT_EQ(*ask(client), kept);
+  }
+  source.attempts = true;
+  source.answersNotModified = true;
+  EXPECT_EQ(*ask(client), kept);
+  EXPECT_EQ(source.fetches, 6);
+  EXPECT_EQ(source.conditional, std::nullopt);
+}
+
 TEST_F(Agent, TypesThatShareAStorebagShareOneDownload) {
   const auto first = connect(7);
   const auto second = connect(13);

@@ -94,6 +94,53 @@ class Adaptor(SystemTest):
                 self.is_deaf(daemon, line)
                 daemon.wait_for_line(reason)
 
+    def test_an_exit_is_no_end(self):
+        """A service manager starts the daemon again, because its status is that of a failure."""
+        for fault in ("exits", "exitsQuickly"):
+            with self.subTest(fault):
+                shutil.copy(BUILD / f"lib/adaptor_{fault}.so", self.file)
+                daemon = self.daemon()
+                session, _ = self.open()
+                self.assertEqual(daemon.end(), 1)
+                self.assertIn("code in the process has called exit", daemon.text[-1])
+                session.kill()
+
+    def test_links_are_looked_at_from_both_ends(self):
+        """Each row: what is at fault on the way, and what a link in the bundle's directory leads to."""
+        inside, outside, foreign = self.file.parent / "inside", self.root.path / "outside", self.root.path / "foreign"
+        theirs = "expected the file and every directory above it to be owned by root or the daemon's own user"
+        for directory in (inside, outside, foreign):
+            directory.mkdir()
+            shutil.copy(GOOD, directory / "adaptor.so")
+        (inside / "step").symlink_to(foreign / "back")
+        (foreign / "back").symlink_to(inside)
+        (inside / "deep").mkdir()
+        table = [("inside/adaptor.so", None, None), ("../../../../../../../outside/adaptor.so", None, "out of the bundle"),
+                 (str(outside / "adaptor.so"), None, "out of the bundle"), ("inside/adaptor.so", inside, theirs),
+                 ("inside/step/adaptor.so", None, None), ("inside/step/adaptor.so", foreign, theirs),
+                 ("inside/deep/../adaptor.so", inside / "deep", theirs), ("PellmarchPerformance.so", None, "nowhere")]
+        if os.getuid() == 0:
+            table += [("inside/adaptor.so", self.file, theirs), ("inside/step/adaptor.so", foreign / "back", theirs)]
+        for target, fault, reason in table:
+            with self.subTest(target=target, fault=fault), self.serving(*[NONE] * bool(reason), DEAF.format("(null)")) as daemon:
+                self.file.unlink(missing_ok=True)
+                self.file.symlink_to(target)
+                if fault and fault.is_symlink():
+                    os.lchown(fault, 12345, -1)
+                elif fault:
+                    fault.chmod(0o777)
+                session, _ = self.open()
+                if reason:
+                    self.assertIn(reason, daemon.wait_for_line(NONE))
+                else:
+                    wait_until(lambda: self.messages(), "the start message")
+                self.assertEqual(session.close(), 0)
+                (self.root.path / "var/log/veltrad/example-adaptor.jsonl").unlink(missing_ok=True)
+                if fault and fault.is_symlink():
+                    os.lchown(fault, 0, -1)
+                elif fault:
+                    fault.chmod(0o755)
+
     def test_device_without_adaptor(self):
         shutil.copy(GOOD, self.file)
         self.root.write("etc/veltrad/device.plist", {"ProductType": "Halvorn", "UniqueDeviceID": "ab" * 20})

@@ -87,6 +87,12 @@ class Energy(SystemTest):
             daemon.wait_for_line(LOST, 2)
             self.file.unlink()
             session.send(who=5)
+            with open(self.file, "ab") as torn:  # by a daemon that was killed within a line
+                torn.write(b'{"client": 28, "na')
+            session.send(who=6)
+            *lines, half, last = self.file.read_bytes().splitlines()
+            self.assertEqual((half, json.loads(last)["event"]["who"]), (b'{"client": 28, "na', 6))
+            self.file.write_bytes(b"".join(line + b"\n" for line in lines))
             self.assertEqual([line["event"]["who"] for line in self.events()], [1, 3, 5])
             self.assertEqual(victim.read_text(), "kept")
             wait_until(lambda: self.lost() == 4, "the count of what was lost")

@@ -363,10 +363,11 @@ class Hostile(HTTPSTest):
                 self.assertEqual([event[key] for key in ("at", "clientName", "serviceName")],
                                  [1416168834, name, name[::-1]])
                 self.assertFalse({"list", "more", "raw", "nan"} & set(event))
-                client.message(9, 9, **{"list\n<3>faked": [1]})
+                client.message(9, 9, **{"list\n<3>faked": [1], "x" * 9000: [["y" * 9000]]})
                 client.close()
             posts = self.posts("phone", 4 * (len(self.TEXTS) - 1))
             daemon.wait_for_line("Quillfen unable to handle key: list\\x0A<3>faked, value: [1]", len(self.TEXTS) - 1)
+            self.assertRegex(daemon.wait_for_line("key: xxx"), r"x… \(7976 bytes cut\), value: \[\[\"y+… \(7980 bytes cut\)$")
         allowed = {"Host", "User-Agent", "Accept", "Content-Type", "Content-Length", "Content-Encoding", "X-VLT-Sender",
                    "X-VLT-Client-Name", "X-VLT-Service-Name", "X-VLT-Client-Version", "X-VLT-Event-Map"}
         for post in posts:

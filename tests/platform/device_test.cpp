@@ -88,6 +88,34 @@ TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChange
   EXPECT_EQ(value("UniqueDeviceID"), Text());
 }
 
+// Neither the machine nor a default is asked instead: it may say something else.
+TEST_F(MachinePropertiesTest, DuringAShortageWhatWasLastReadServesOrNothing) {
+  put({{"SerialNumber", "S1"}});
+  _files.put("/usr/lib/os-release", "VERSION_ID=13\n");
+  _files.put("/etc/os-release", "VERSION_ID=12\n");
+  for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName"}) {
+    for (const char* path : {kList, "/etc/os-release", "/proc/cpuinfo"})
+      _files.failReads(path, FileFailure::Kind::shortage);
+    EXPECT_FALSE(_properties.value(key)) << key;
+    _files.failReads(kList, {});
+    EXPECT_EQ(_properties.value(key).ok(), key == std::string("SerialNumber")) << key;
+    for (const char* path : {"/etc/os-release", "/proc/cpuinfo"}) _files.failReads(path, {});
+  }
+  MachineProperties properties{_files, kList};
+  const auto all = [&] {
+    std::string texts;
+    for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName", "BuildVersion"})
+      texts += properties.value(key).ok() ? properties.value(key).value().value_or("-") + " " : "? ";
+    return texts;
+  };
+  _files.runShort(true, true);
+  EXPECT_EQ(all(), "? ? ? ? ");
+  _files.runShort(false);
+  EXPECT_EQ(all(), "S1 12 Computer - ");
+  _files.runShort(true, true);
+  EXPECT_EQ(all(), "S1 12 Computer - ");
+}
+
 TEST(Locale, FindsTheCountryInALocaleName) {
   std::string countries;
   for (const char* name : {"de_DE.UTF-8", "de_DE", "de_DE@euro", "es_419", "en_gb", "ca_ES.UTF-8@valencia"})

@@ -95,6 +95,22 @@ TEST_F(EntitlementsTest, AFileThatCannotBeReadGrantsNothingAndIsOneLineAChange) 
   for (int i = 0; i < 2; ++i) EXPECT_FALSE(granted());
 }
 
+TEST_F(EntitlementsTest, TheLastRulesStandDuringAShortage) {
+  put({rule({{"uid", 1'000}})});
+  _log.expectLine(LogLevel::warning, "Entitlements could not be read just now, the last rules stand: ");
+  _files.runShort(true);
+  EXPECT_FALSE(granted());  // never read
+  _files.runShort(false);
+  EXPECT_TRUE(granted());
+  put({rule({{"uid", 0}})});
+  for (const bool stampsFail : {false, true}) {
+    _files.runShort(true, stampsFail);
+    EXPECT_TRUE(granted());
+  }
+  _files.runShort(false);
+  EXPECT_FALSE(granted());
+}
+
 TEST_F(EntitlementsTest, ARuleThatCanNeverMatchIsNamedOnce) {
   put({rule({{"uid", 1'000}}), rule({}), rule({{"gid", "wheel"}}), Dictionary{{"uid", 1}}, 5});
   for (const char* text :

@@ -85,6 +85,38 @@ TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
   EXPECT_NE(FilePreferences(_files, "/preferences").textOrStore(kDomain, "id", randomUUIDText), made);
 }
 
+// Another identifier than the stored one is never made, kept or stored.
+TEST_F(FilePreferencesTest, AShortageIsNoAnswer) {
+  put({{"id", "stored"}});
+  for (const bool stampsFail : {false, true}) {
+    FilePreferences preferences(_files, "/preferences");
+    _files.runShort(true, stampsFail);
+    EXPECT_FALSE(preferences.lookUp(kDomain, "id"));
+    EXPECT_EQ(preferences.textOrStore(kDomain, "id", randomUUIDText), std::nullopt);
+    _files.runShort(false);
+    EXPECT_EQ(preferences.textOrStore(kDomain, "id", randomUUIDText), "stored");
+    _files.runShort(true, stampsFail);
+    EXPECT_EQ(preferences.lookUp(kDomain, "id").ok(), !stampsFail);
+    _files.runShort(false);
+  }
+  EXPECT_EQ(_preferences.text(kDomain, "id"), "stored");
+  // What it has changed to meanwhile is not known; consent that may have gone is none.
+  put({{"id", "other"}});
+  _files.runShort(true);
+  EXPECT_EQ(_preferences.value(kDomain, "id"), std::nullopt);
+  _files.runShort(false);
+  EXPECT_EQ(_preferences.text(kDomain, "id"), "other");
+  // Nothing is stored, and that is known: what is made now is stored as soon as it can be.
+  _files.runShort(true);
+  _log.expectLine(Level::error, "Preference not stored, its file cannot be read: /preferences/");
+  const auto made = _preferences.textOrStore(kDomain, "new", randomUUIDText);
+  ASSERT_TRUE(made);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", randomUUIDText), made);
+  _files.runShort(false);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", randomUUIDText), made);
+  EXPECT_EQ(FilePreferences(_files, "/preferences").text(kDomain, "new"), made);
+}
+
 TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
   RecordedLog log;
   TemporaryDirectory directory;

@@ -1,11 +1,21 @@
 // An adaptor bundle with the fault that FAULT names; tests/e2e/test_adaptor.py says what becomes of each.
 #include <veltra/adaptor.h>
 
+#include <cstdlib>
 #include <stdexcept>
 
 namespace {
 
-enum Fault { otherVersion, otherClass, noInstance, noOperation, throwsAtCreation, throws };
+enum Fault {
+  otherVersion,
+  otherClass,
+  noInstance,
+  noOperation,
+  throwsAtCreation,
+  throws,
+  exits,
+  exitsQuickly
+};
 
 int instance;
 
@@ -19,6 +29,8 @@ void destroy(void*) {
 }
 
 void send(void*, std::uint16_t, std::uint16_t, const veltra_adaptor_value*) {
+  if (FAULT == exits) std::exit(0);
+  if (FAULT == exitsQuickly) std::quick_exit(0);
   throw std::runtime_error("no message today");
 }
 
