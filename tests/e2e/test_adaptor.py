@@ -4,7 +4,7 @@ import os
 import shutil
 from pathlib import Path
 
-from harness import BUILD, Root, SystemTest, closed_port, wait_until
+from harness import BUILD, Ctl, Root, SystemTest, closed_port, wait_until
 
 BUNDLE = ("System/Library/PrivateFrameworks/PellmarchServices.framework/Frameworks/PellmarchPerformance.framework/"
           "PellmarchPerformance.so")
@@ -99,11 +99,10 @@ class Adaptor(SystemTest):
         for fault in ("exits", "exitsQuickly"):
             with self.subTest(fault):
                 shutil.copy(BUILD / f"lib/adaptor_{fault}.so", self.file)
-                daemon = self.daemon()
-                session, _ = self.open()
+                daemon, session = self.daemon(), Ctl(self.root)  # the start message goes to the adaptor, too
+                self.addCleanup(session.kill)
                 self.assertEqual(daemon.end(), 1)
                 self.assertIn("code in the process has called exit", daemon.text[-1])
-                session.kill()
 
     def test_links_are_looked_at_from_both_ends(self):
         """Each row: what is at fault on the way, and what a link in the bundle's directory leads to."""
@@ -115,7 +114,7 @@ class Adaptor(SystemTest):
         (inside / "step").symlink_to(foreign / "back")
         (foreign / "back").symlink_to(inside)
         (inside / "deep").mkdir()
-        table = [("inside/adaptor.so", None, None), ("../../../../../../../outside/adaptor.so", None, "out of the bundle"),
+        table = [("inside/adaptor.so", None, None), ("../../../../../../outside/adaptor.so", None, "out of the bundle"),
                  (str(outside / "adaptor.so"), None, "out of the bundle"), ("inside/adaptor.so", inside, theirs),
                  ("inside/step/adaptor.so", None, None), ("inside/step/adaptor.so", foreign, theirs),
                  ("inside/deep/../adaptor.so", inside / "deep", theirs), ("PellmarchPerformance.so", None, "nowhere")]
