@@ -384,7 +384,11 @@ class SystemTest(unittest.TestCase):
     def serving(self, *allowed, **options):
         daemon = self.daemon(**options)
         daemon.allow(*allowed)
-        yield daemon
+        try:
+            yield daemon
+        except BaseException:
+            daemon.kill()  # the next row of a table can start its own
+            raise
         daemon.stop()
 
     def open(self, *arguments, deadline=DEADLINE, **options):
