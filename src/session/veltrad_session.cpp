@@ -130,6 +130,8 @@ void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandl
 void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   const SharedDictionary info = sessionInfo();
+  // It may have been out of reach when the client connected.
+  if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
   auto made =
       createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
                      &storebag, info.get(), userInfo(), deviceID());

@@ -129,9 +129,9 @@ class VeltradSession final : public ClientSessionInterface,
   VeltradSessionDelegate& _sessionDelegate;
   const std::string _sessionIDString;                       // base64 of 16 random bytes
   const std::shared_ptr<platform::MemoryAccount> _account;  // null: nobody pays
-  char _deviceid[41] = {};  // NUL-terminated; all zero when the device has no identifier
 
   // The connection's thread only.
+  char _deviceid[41] = {};           // NUL-terminated; all zero while the device has no identifier
   std::optional<Array> _frameworks;  // kept, not interpreted
 
   std::atomic<std::uint32_t> _sessionID{0};
