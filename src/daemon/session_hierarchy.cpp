@@ -72,10 +72,7 @@ std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const Veltra
 
 std::shared_ptr<VeltradSession> VeltradAgent::getAncestorWithAggregatorForSession(
     const VeltradSession& session) {
-  if (!session.userInfo()) {
-    logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", session.sessionID());
-    return nullptr;
-  }
+  if (!session.userInfo()) return nullptr;  // which the session says
   const std::int32_t hierarchy = session.getSessionHierarchy();
   const CorrelatedList* list = hierarchy < 1 ? nullptr : correlatedList(session);
   return list ? list->topmostAggregator(hierarchy) : nullptr;

@@ -22,7 +22,7 @@ void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16
 
 void VeltradSession::sendMessageWithDictionary(Dictionary message, StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
-  const auto answer = sendMessageWithDictionary(message);
+  const auto answer = sendMessageWithDictionary(message, Origin::client);
   if (reply) reply(answer);
 }
 
@@ -33,19 +33,23 @@ void VeltradSession::finishSessionWithReply(StringReply reply) {
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                                                   OptionalDictionary payload) {
+                                                                   OptionalDictionary payload,
+                                                                   Origin origin) {
   Dictionary message{{kVeltraMessageParametersCategory, unsigned{category}},
                      {kVeltraMessageParametersFlag, 0u},
                      {kVeltraMessageParametersType, unsigned{type}}};
   if (payload) message.set(kVeltraMessageParametersPayload, std::move(*payload));
-  return sendMessageWithDictionary(message);
+  return sendMessageWithDictionary(message, origin);
 }
 
-std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message) {
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
+                                                                     Origin origin) {
   const auto set = backends();
   if (!set) {
     logDebug("sendMessageWithDictionary: No backends available to send message");
-    _services.counters.count("message dropped: the session has no back ends");
+    if (origin == Origin::client) {
+      _services.counters.count("message dropped: the session has no back ends");
+    }
     return std::nullopt;
   }
   const auto category = message.uint32(kVeltraMessageParametersCategory);
@@ -66,6 +70,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count("message taken in");
+  sayWithoutUserInfo();
   if (hasAggregator() || getSessionHierarchy() > 0) {
     aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
   }
@@ -89,8 +94,16 @@ std::optional<std::string> VeltradSession::offerToBackends(const BackendSet& set
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, OptionalDictionary(payload));
+  sendMessageWithCategory(method, respCode, OptionalDictionary(payload), Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
+}
+
+// Once, not for each message; a root says it too, though nobody looks for its ancestors.
+void VeltradSession::sayWithoutUserInfo() {
+  if (_saidWithoutUserInfo) return;
+  _saidWithoutUserInfo = true;
+  if (userInfo()) return;
+  logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", sessionID());
 }
 
 void VeltradSession::aggregateMessage(const SharedDictionary& info, double timestamp, std::uint16_t category,
@@ -217,10 +230,7 @@ void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, Optiona
   const auto kept = std::make_shared<const Dictionary>(std::move(*info));
   const SharedDictionary identity =
       userInfo ? std::make_shared<const Dictionary>(std::move(*userInfo)) : nullptr;
-  {
-    const Lock held(_mutex);
-    _sessionInfo = kept;
-  }
+  keepSessionInfo(kept);
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
   const SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);

@@ -90,7 +90,7 @@ std::optional<std::int32_t> VeltradSession::clientType() const {
 }
 
 void VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
-                                    std::optional<Array> frameworksToCheck, bool hasAggregationBlock) {
+                                    std::optional<Array>, bool hasAggregationBlock) {
   const std::uint32_t number = sessionInfo ? sessionInfo->uint32(kVeltraSessionInfoSessionID).value_or(0) : 0;
   _sessionID.store(number, std::memory_order_relaxed);
   logDebug("setSessionInfo: Configuring session %u", number);
@@ -99,13 +99,20 @@ void VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDict
   if (userInfo && !required) {
     logWarning("setSessionInfo: Configure session: user info provided without requiring it");
   }
-  _frameworks = std::move(frameworksToCheck);
-  {
-    const Lock held(_mutex);
-    _sessionInfo = shared(std::move(sessionInfo));
-    _userInfo = shared(std::move(userInfo));
-  }
+  keepSessionInfo(shared(std::move(sessionInfo)));
+  keepUserInfo(shared(std::move(userInfo)));
   _hasAggregator.store(hasAggregationBlock, std::memory_order_relaxed);
+}
+
+void VeltradSession::keepSessionInfo(SharedDictionary info) {
+  const Lock held(_mutex);
+  _sessionInfo.swap(info);
+}
+
+void VeltradSession::keepUserInfo(SharedDictionary info) {
+  _saidWithoutUserInfo = false;
+  const Lock held(_mutex);
+  _userInfo.swap(info);
 }
 
 void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandler) {
@@ -199,10 +206,7 @@ void VeltradSession::receivedUserInfo(SharedDictionary updated) {
   const bool unchanged = current && updated && sameName(*current, *updated, kVeltraUserInfoClientName) &&
                          sameName(*current, *updated, kVeltraUserInfoServiceName);
   const auto take = [this, &updated] {
-    {
-      const Lock held(_mutex);
-      _userInfo = std::move(updated);
-    }
+    keepUserInfo(std::move(updated));
     updateUserInfoForBackends();
   };
   if (unchanged) return take();
@@ -277,18 +281,15 @@ void VeltradSession::updateCombinedSessionID() {
   }
 }
 
-void VeltradSession::sayDroppedCopies() {
-  if (const auto line = _dropLine.rest()) logError("%s", line->c_str());
-}
-
 void VeltradSession::end() {
   logDebug("dealloc: VeltradSession dealloc: %u", sessionID());
-  sayDroppedCopies();
   Dictionary payload;
   payload.setIfPresent("StorebagVersion", storebagVersion());
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
   if (const auto line = shutdownSessionAggregation()) logError("%s", line->c_str());
+  // Nobody sends to this client any more: the invalidation has taken the session from its list.
+  if (const auto line = _dropLine.rest()) logError("%s", line->c_str());
   std::shared_ptr<const BackendSet> released;
   std::shared_ptr<Connection> connection;  // may be the last reference: goes after the lock
   {
@@ -302,7 +303,6 @@ void VeltradSession::end() {
   if (released) {
     for (const auto& [name, backend] : *released) backend->cleanup();
   }
-  _frameworks = std::nullopt;
 }
 
 }  // namespace veltrad

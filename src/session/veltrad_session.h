@@ -52,6 +52,7 @@ class VeltradSession final : public ClientSessionInterface,
                                                                  std::shared_ptr<Connection> connection);
   ~VeltradSession() override;
 
+  // The frameworks are not looked at.
   void setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                       std::optional<Array> frameworksToCheck, bool hasAggregationBlock) override;
   void startConfigWithCompletionHandler(NamesReply completionHandler) override;
@@ -103,10 +104,16 @@ class VeltradSession final : public ClientSessionInterface,
   void updateSessionWithDefaultSessionInfo();
   void refreshStates();
   void receivedUserInfo(SharedDictionary userInfo);
+  // What is kept for the session's life goes through these two.
+  void keepSessionInfo(SharedDictionary info);
+  void keepUserInfo(SharedDictionary info);
   // Through the checks to the aggregating client and every backend; the answer for the client, or none.
+  enum class Origin { client, session };  // whose message it is: the session's own are not missed
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                                     OptionalDictionary payload);
-  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message);
+                                                     OptionalDictionary payload,
+                                                     Origin origin = Origin::client);
+  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, Origin origin);
+  void sayWithoutUserInfo();
   void aggregateMessage(const SharedDictionary& sessionInfo, double timestamp, std::uint16_t category,
                         std::uint16_t type, const Dictionary* payload);
   // To this session's own client, without waiting; the registry's lock may be held. The line to log, once no
@@ -114,7 +121,6 @@ class VeltradSession final : public ClientSessionInterface,
   std::optional<std::string> sendToAggregator(const SharedDictionary& sessionInfo, double timestamp,
                                               std::uint16_t category, std::uint16_t type,
                                               OptionalDictionary payload);
-  void sayDroppedCopies();
   std::optional<std::string> offerToBackends(const BackendSet& backends, const Dictionary* payload,
                                              platform::TimeValue time, std::uint16_t category,
                                              std::uint16_t type, std::int32_t flag);
@@ -132,7 +138,7 @@ class VeltradSession final : public ClientSessionInterface,
 
   // The connection's thread only.
   char _deviceid[41] = {};           // NUL-terminated; all zero while the device has no identifier
-  std::optional<Array> _frameworks;  // kept, not interpreted
+  bool _saidWithoutUserInfo = false;  // since the user info was last given
 
   std::atomic<std::uint32_t> _sessionID{0};
   std::atomic<bool> _hasAggregator{false};

@@ -205,6 +205,26 @@ TEST_F(Agent, ADownloadThatWasNoAttemptLeavesTheRecordAsItWas) {
   EXPECT_EQ(source.conditional, std::nullopt);
 }
 
+TEST_F(Agent, ASessionWithoutUserInfoSaysSoAtItsFirstMessageAndAfterAChange) {
+  const auto session = connect()->session;
+  const auto lines = [&](int count) {
+    EXPECT_EQ(log.count(RecordedLog::Level::info, "getAncestorWithAggregatorForSession: No user info found"),
+              count);
+  };
+  session->setSessionInfo(Dictionary{{"clientType", 7}}, std::nullopt, std::nullopt, false);
+  lines(0);
+  session->startConfigWithCompletionHandler(nullptr);  // the start message is the first
+  lines(1);
+  session->sendMessageWithCategory(1, 1, std::nullopt, nullptr);
+  lines(1);
+  session->fetchStatesWithUserInfo(Dictionary{{"clientName", "Gamma"}}, nullptr);
+  session->sendMessageWithCategory(1, 1, std::nullopt, nullptr);
+  lines(1);
+  session->fetchStatesWithUserInfo(std::nullopt, nullptr);
+  session->sendMessageWithCategory(1, 1, std::nullopt, nullptr);
+  lines(2);
+}
+
 TEST_F(Agent, TypesThatShareAStorebagShareOneDownload) {
   const auto first = connect(7);
   const auto second = connect(13);

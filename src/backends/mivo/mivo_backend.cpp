@@ -19,19 +19,23 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& se
                                                        const std::string& name, const Dictionary* profile,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, profile, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
     return nullptr;
   }
-  return std::shared_ptr<MivoBackend>(new MivoBackend(services, name, profile, productFamily));
+  backend->loadAdaptor();
+  return backend;
 }
 
 MivoBackend::MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
                          const std::string& productFamily)
     : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
       _counters(services.counters),
-      _clientBundle(services.adaptorBundle) {
+      _clientBundle(services.adaptorBundle) {}
+
+void MivoBackend::loadAdaptor() {
   std::string failure;
   const auto found = adaptorClassNamed(_clientBundle, VELTRA_ADAPTOR_CLASS);
   if (found.ok()) {

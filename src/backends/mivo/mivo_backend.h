@@ -33,8 +33,9 @@ class MivoBackend final : public VeltraBackend {
  private:
   MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
               const std::string& productFamily);
+  void loadAdaptor();
 
-  // Constant after construction.
+  // Constant after initialisation.
   platform::Counters& _counters;
   platform::CodeBundle& _clientBundle;
   const veltra_adaptor_class* _mivoAdaptorClass = nullptr;
