@@ -19,10 +19,10 @@ constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 
 std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
-    std::int32_t clientType) {
+    std::int32_t clientType, const BackendOwner& owner) {
   if (name == kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName(_services, _logData, name, profile.asDictionary(),
-                                          productFamily.value_or(""));
+    return DashboardBackend::initWithName({_services, _logData, _dashboards, owner}, name,
+                                          profile.asDictionary(), productFamily.value_or(""));
   }
   if (name == kVeltraBackendUploadServer) {
     return UploadBackend::initWithName(_services, _files, name, profile.asDictionary(),

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "backends/backend.h"
+#include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
 #include "backends/https/post_errors.h"
 #include "backends/upload/file_uploads.h"
@@ -45,13 +46,20 @@ struct BackendServices {
   std::string scratchDirectory = "/tmp";  // for files without a name
 };
 
+// Who has a back end made.
+struct BackendOwner {
+  std::shared_ptr<platform::MemoryAccount> account = nullptr;  // null: nobody pays
+  bool oneShot = false;                                        // for one message, not for a session
+};
+
 class BackendFactory {
  public:
   virtual ~BackendFactory() = default;
   // Null: no such backend here, or it cannot work with this profile; one line has said so.
   virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                             const std::optional<std::string>& productFamily,
-                                                            std::int32_t clientType) = 0;
+                                                            std::int32_t clientType,
+                                                            const BackendOwner& owner = {}) = 0;
 };
 
 class StandardBackendFactory final : public BackendFactory {
@@ -60,7 +68,8 @@ class StandardBackendFactory final : public BackendFactory {
       : _services(services), _logData(services.http, services.counters) {}
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    std::int32_t clientType) override;
+                                                    std::int32_t clientType,
+                                                    const BackendOwner& owner = {}) override;
   // The lines that were held back: before the daemon ends.
   void sayRest() { _postErrors.sayRest(); }
 
@@ -68,6 +77,7 @@ class StandardBackendFactory final : public BackendFactory {
   const BackendServices _services;
   PostErrors _postErrors;
   LogDataUploads _logData;
+  const std::shared_ptr<DashboardQueues> _dashboards = std::make_shared<DashboardQueues>();
   FileUploads _files;
 };
 

@@ -33,7 +33,8 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, co
   const std::int32_t clientType = sessionInfo->int32(kVeltraSessionInfoClientType).value_or(0);
   const auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : *storebag) {
-    const auto backend = making.factory.newBackendWithName(name, profile, productFamily, clientType);
+    const auto backend = making.factory.newBackendWithName(name, profile, productFamily, clientType,
+                                                           {making.account, making.oneShot});
     if (!backend) continue;
     backend->setSessionID(sessionInfo->uint32(kVeltraSessionInfoSessionID).value_or(0));
     backend->setCompType(clientType);

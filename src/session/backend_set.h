@@ -28,6 +28,7 @@ struct BackendMaking {
   const Veltra& library;
   platform::Clock& clock;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
+  bool oneShot = false;
 };
 
 // One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,

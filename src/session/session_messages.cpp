@@ -241,7 +241,7 @@ void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, Optiona
   }
   _services.counters.count("message taken in: one-shot");
   veltrad::sendMessageWithSessionInfo(
-      {_services.factory, _services.device, _services.library, _services.clock, _account},
+      {_services.factory, _services.device, _services.library, _services.clock, _account, true},
       _services.messageLog,
       {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
   if (reply) reply("finished");

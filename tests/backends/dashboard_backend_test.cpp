@@ -1,15 +1,18 @@
 // The dashboard back end at its door: datagrams as a real socket receives them, and the lines that come back.
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/socket.h>
 
 #include <filesystem>
 
 #include "backends/dashboard/dashboard_backend.h"
+#include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
 #include "platform/file_descriptor.h"
+#include "platform/memory_budget.h"
 #include "protocol/constants.h"
 
 namespace veltrad {
@@ -43,10 +46,21 @@ struct DashboardServer {
 
 class Dashboard : public ::testing::Test {
  protected:
-  std::shared_ptr<VeltraBackend> make(const Dictionary& more = {}) {
+  std::shared_ptr<VeltraBackend> make(const Dictionary& more = {}, const BackendOwner& owner = {}) {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", unsigned{server.port}}};
     profile.merge(more);
-    return configured(world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7));
+    return configured(
+        world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7, owner));
+  }
+  // A message that nobody acknowledges, and the end of its back end.
+  void sendAndEnd(const BackendOwner& owner) {
+    const auto backend = make({{"reliable", 60'000}}, owner);
+    backend->sendMessage(nullptr, kTime, 1, 1, 0);
+    backend->cleanup();
+  }
+  static std::ptrdiff_t entries(const char* directory) {
+    const std::filesystem::directory_iterator all(directory);
+    return std::distance(begin(all), end(all));
   }
   std::shared_ptr<VeltraBackend> configured(std::shared_ptr<VeltraBackend> backend) {
     backend->setCompType(7);
@@ -63,8 +77,8 @@ class Dashboard : public ::testing::Test {
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
   LogDataUploads uploads(world.http, world.counters);
-  const auto direct =
-      DashboardBackend::initWithName(world.services, uploads, "direct", "127.0.0.1"s, server.port, "Desktop");
+  const DashboardMaking making{world.services, uploads, std::make_shared<DashboardQueues>(), {}};
+  const auto direct = DashboardBackend::initWithName(making, "direct", "127.0.0.1"s, server.port, "Desktop");
   const std::pair<std::shared_ptr<VeltraBackend>, char> cases[] = {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
@@ -118,34 +132,86 @@ TEST_F(Dashboard, ADeviceWithoutIdentifierAndAnUnknownComponent) {
 }
 
 TEST_F(Dashboard, AProfileThatNamesNoServerMakesNone) {
-  const auto refused = [&](const Value& profile, const char* line) {
-    log.expectLine(Level::error, "DashboardBackend(initWithName): "s + line);
-    EXPECT_EQ(world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
+  // Whether the base was made, and so has drawn, before the fault was seen.
+  struct Counting final : platform::Random {
+    double uniform() override { return ++draws, 0.5; }
+    int draws = 0;
+  } random;
+  const BackendServices& w = world.services;
+  StandardBackendFactory factory({w.http, w.clock, random, w.locale, w.preferences, w.counters, w.energyLog,
+                                  w.adaptorBundle, w.settings, w.device, w.library, w.pool, w.lentFiles});
+  const auto refused = [&](const Value& profile, int draws, const char* line,
+                           const char* name = kVeltraBackendDashboard) {
+    log.expectLine(Level::error, line);
+    const int before = random.draws;
+    EXPECT_EQ(factory.newBackendWithName(name, profile, "Desktop", 7), nullptr);
+    EXPECT_EQ(random.draws - before, draws) << line;
   };
-  refused("text", "initWitName with all null params.");
-  refused(Dictionary{{"port", 9}}, "can't resolve server IP");
-  refused(Dictionary{{"ip", "127.0.0.1"}}, "can't resolve server port");
+  refused("text", 1, "DashboardBackend(initWithName): initWitName with all null params.");
+  refused(Dictionary{{"port", 9}}, 0, "DashboardBackend(initWithName): can't resolve server IP");
+  refused(Dictionary{{"ip", "127.0.0.1"}}, 0, "DashboardBackend(initWithName): can't resolve server port");
   for (const char* ip : {"localhost", "127.1", "::1", "127.0.0.1 ", "1000.000.000.001", ""}) {
-    refused(Dictionary{{"ip", ip}, {"port", 9}}, "can't resolve server IP");
+    refused(Dictionary{{"ip", ip}, {"port", 9}}, 1,
+            "DashboardBackend(initWithName): can't resolve server IP");
   }
-  refused(Dictionary{{"ip", "255.255.255.255"}, {"port", 9}}, "socket connect() failed.");
+  refused(Dictionary{{"ip", "255.255.255.255"}, {"port", 9}}, 1,
+          "DashboardBackend(initWithName): socket connect() failed.");
+  refused(Dictionary{}, 0, "UploadBackend(initWithName): can't resolve upload post URL.",
+          kVeltraBackendUploadServer);
+  refused(Dictionary{}, 0, "HTTPSPostBackend(initWithName): can't find the client list.",
+          kVeltraBackendHTTPPost);
+  log.expectLine(Level::error, "MivoBackend(initWithName): No matching bundle found for client type 6");
+  const int before = random.draws;
+  EXPECT_EQ(factory.newBackendWithName(kVeltraBackendMivo, Dictionary{}, "Desktop", 6), nullptr);
+  EXPECT_EQ(random.draws - before, 1);
 }
 
-TEST_F(Dashboard, ManyBackEndsShareTwoThreadsAndTheEndCountsWhatWaits) {
-  const auto threads = [] {
-    const std::filesystem::directory_iterator tasks("/proc/self/task");
-    return std::distance(begin(tasks), end(tasks));
-  };
-  const auto before = threads();
-  for (int i = 0; i < 300; ++i) {
-    const auto backend = make({{"reliable", 60'000}});
-    backend->sendMessage(nullptr, kTime, 1, 1, 0);
-    backend->cleanup();
+TEST_F(Dashboard, SoManyLingerOfAUserAndInAllAndTheOldestEnds) {
+  platform::MemoryBudget budget;
+  const auto threads = entries("/proc/self/task");
+  const char* const ended = "datagram given up: too many dashboards waited after their sessions";
+  sendAndEnd({});  // nobody's, and the oldest of all: ended last, for want of room in all
+  const auto descriptors = entries("/proc/self/fd");
+  for (int i = 0; i < 70; ++i) sendAndEnd({budget.accountOf(1)});
+  EXPECT_EQ(entries("/proc/self/task"), threads + 2);
+  EXPECT_EQ(world.counters.value(ended), 6u);
+  EXPECT_EQ(entries("/proc/self/fd"), descriptors + 64);
+  EXPECT_GT(budget.used(), 64u * 8192);
+  EXPECT_LT(budget.used(), 64u * 10'000);
+  for (unsigned user = 2; user <= 5; ++user) {
+    for (int i = 0; i < 50; ++i) sendAndEnd({budget.accountOf(user)});
   }
-  EXPECT_EQ(threads(), before + 2);
+  EXPECT_EQ(entries("/proc/self/fd"), descriptors + 255);
+  EXPECT_EQ(world.counters.value(ended), 6u + 9);  // 1 + 64 + 4 * 50 = 265
   world.pool.drain(std::chrono::steady_clock::now());
   world.pool.discard();
-  EXPECT_EQ(world.counters.value("datagram given up: not acknowledged before its back end ended"), 300u);
+  EXPECT_EQ(world.counters.value("datagram given up: not acknowledged before its back end ended"), 256u);
+  EXPECT_EQ(budget.used(), 0u);
+}
+
+TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
+  platform::MemoryBounds bounds;
+  bounds.userKept = 30'000;
+  platform::MemoryBudget budget(bounds);
+  const auto account = budget.accountOf(1);
+  for (int i = 0; i < 5; ++i) sendAndEnd({account});  // three fit
+  EXPECT_EQ(world.counters.value("datagram given up: no memory for its dashboard after its session"), 2u);
+  const auto backend = make({{"reliable", 60'000}}, {account});
+  for (int i = 0; i < 20; ++i) backend->sendMessage(nullptr, kTime, 1, 1, 0);
+  EXPECT_GT(world.counters.value("datagram given up: no memory to await its acknowledgement"), 5u);
+  EXPECT_EQ(world.counters.value("datagram sent"), 25u);
+
+  rlimit before{};
+  ::getrlimit(RLIMIT_NOFILE, &before);
+  const platform::FileDescriptor lowest(::dup(0));
+  const rlimit full{rlim_t(lowest.get()), before.rlim_max};
+  ::setrlimit(RLIMIT_NOFILE, &full);
+  std::vector<std::shared_ptr<VeltraBackend>> made;
+  for (int i = 0; i < 3; ++i) made.push_back(make({}, {account}));
+  log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
+  const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
+  EXPECT_EQ(world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
+  ::setrlimit(RLIMIT_NOFILE, &before);
 }
 
 }  // namespace

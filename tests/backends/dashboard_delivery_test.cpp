@@ -46,8 +46,8 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
                          {false, {}, {0}, 0},                       // sent is done
                          {false, {0, 1, 2}, {3}, 3}}) {
     Network network(c.closed);
-    MessageQueue queue(c.reliable, network.send());
-    EXPECT_EQ(queue.tryToSendMsg("datagram", 1).sent, !c.closed.contains(0));
+    MessageQueue queue(c.reliable, false, network.send());
+    EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).sent, !c.closed.contains(0));
     std::size_t givenUp = 0;
     while (!queue.empty() && network.now < 100) {
       ++network.now;
@@ -59,33 +59,76 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
   }
 }
 
-TEST(DashboardDelivery, FiftyWaitAndTheOldestMakesRoom) {
-  Network network({0});
-  MessageQueue queue(false, network.send());
-  for (std::uint16_t event = 0; event <= 50; ++event) {
-    EXPECT_EQ(queue.tryToSendMsg(std::to_string(event), event).pushedOut, event == 50);
+TEST(DashboardDelivery, SoManyWaitAndTheOldestMakesRoom) {
+  for (const auto& [shared, most] : {std::pair{false, 50}, {true, 1024}}) {
+    Network network({0});
+    MessageQueue queue(false, shared, network.send());
+    EXPECT_TRUE(queue.tryToSendMsg("nobody pays", 0, std::nullopt).notKept);
+    for (int event = 0; event <= most; ++event) {
+      EXPECT_EQ(queue.tryToSendMsg(std::to_string(event), 1, platform::Charge()).pushedOut, event == most);
+    }
+    ++network.now;
+    EXPECT_EQ(queue.tick().sent, std::size_t(most));
+    EXPECT_EQ(network.sent.front(), "1");
+    EXPECT_EQ(network.sent.back(), std::to_string(most));
+    EXPECT_TRUE(queue.empty());
   }
-  ++network.now;
-  EXPECT_EQ(queue.tick().sent, 50u);
-  EXPECT_EQ(network.sent.front(), "1");
-  EXPECT_EQ(network.sent.back(), "50");
-  EXPECT_TRUE(queue.empty());
 }
 
 TEST(DashboardDelivery, AnAcknowledgementRemovesTheOldestOfItsNumber) {
   Network network({1});
-  MessageQueue queue(true, network.send());
+  MessageQueue queue(true, false, network.send());
   for (const char* datagram : {"older", "other", "newer"}) {
-    queue.tryToSendMsg(datagram, datagram == std::string("other") ? 8 : 7);  // 7 has come round again
+    queue.tryToSendMsg(datagram, datagram == std::string("other") ? 8 : 7,
+                       platform::Charge());  // 7 has come round again
   }
   ++network.now;
-  queue.tryToSendMsg("not sent yet", 9);
+  queue.tryToSendMsg("not sent yet", 9, platform::Charge());
   EXPECT_FALSE(queue.acknowledge(6));
   EXPECT_TRUE(queue.acknowledge(7));
   EXPECT_TRUE(queue.acknowledge(9));
   network.sent.clear();
   for (int i = 0; i < 2; ++i) ++network.now, queue.tick();
   EXPECT_EQ(network.sent, (std::vector<std::string>{"other", "newer"}));
+}
+
+// All of one number. "A": sent for the first time; ".": a tick, on which those that wait may go out again;
+// "!": an acknowledgement.
+TEST(DashboardDelivery, AnAcknowledgementOfASharedNumberAnswersOneCopy) {
+  struct Case {
+    std::string story;
+    std::string waits;  // at its end
+  };
+  for (const Case& c : std::vector<Case>{
+           {"AB!", "B"},
+           {"AB!!", ""},
+           {"A..!B!", "B"},           // the second was A's retransmission's
+           {"A..!B!!", ""},           // and this is B's own
+           {"AB..!!!!C", "C"},        // two copies of each
+           {"AB..!!C!!", "C"},        // the same, C sent between
+           {"A..!B..!!", ""},         // A's first copy was lost: B is sent once more
+           {"A..!.........B!", "B"},  // the copy of the 2nd tick may still be answered on the 11th
+           {"A..!..........B!", ""},  // on the 12th no more
+           {"A!!B", "B"}}) {
+    Network network({});
+    MessageQueue queue(true, true, network.send());
+    for (const char step : c.story) {
+      if (step == '.') {
+        queue.tick();
+      } else if (step == '!') {
+        queue.acknowledge(1);
+      } else {
+        queue.tryToSendMsg(std::string(1, step), 1, platform::Charge());
+      }
+    }
+    network.sent.clear();
+    const std::size_t waiting = queue.size();
+    while (!queue.empty()) queue.tick();
+    std::string waits;
+    for (std::size_t i = 0; i < waiting && i < network.sent.size(); ++i) waits += network.sent[i];
+    EXPECT_EQ(waits, c.waits) << c.story;
+    EXPECT_EQ(waiting, c.waits.size()) << c.story;
+  }
 }
 
 TEST(DashboardDelivery, TicksStandAtMultiplesAndOnlyWhileSomethingWaits) {
@@ -116,6 +159,9 @@ TEST(DashboardDelivery, CleanUpWaitsForDatagramsUntilTheLastResort) {
   EXPECT_FALSE(schedule.lastResortIsDue(made + 10'499ms));
   EXPECT_TRUE(schedule.lastResortIsDue(made + 10'500ms));
   EXPECT_EQ(schedule.afterTick(made + 10'500ms, false), Verdict::stop);
+  schedule.resume();
+  EXPECT_FALSE(schedule.lastResortIsDue(made + 10'500ms));
+  EXPECT_EQ(schedule.next(made + 10'500ms, false), std::nullopt);
 }
 
 }  // namespace

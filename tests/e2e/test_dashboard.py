@@ -1,14 +1,18 @@
 """The dashboard: datagrams, acknowledgements that are lost or wrong, a server that is not there, the end."""
 import collections
 import json
+import os
 import pathlib
 import socket
+import threading
+import time
 
-from harness import DEADLINE, closed_port, wait_until
+from harness import DEADLINE, Wire, closed_port, wait_until
 from test_https import HTTPSTest, entry
 
 PERIOD = 250  # ms
 TICKS = (2, 5, 10, 19)  # of the transmissions after the first
+ONE_SHOT = "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:"
 
 
 class Dashboard(HTTPSTest):
@@ -117,6 +121,48 @@ class Dashboard(HTTPSTest):
             client.close(), quiet.close()
         log = "".join(path.read_text() for path in pathlib.Path(self.root.path).glob("var/mobile/**/*.diag"))
         self.assertIn("[dashboard -> sendMessageWithDictionary] ", log)
+
+    def test_dashboards_that_linger_keep_nobody_out(self):
+        """1,200 one-shot messages share a socket, 64 sessions of a user linger, others are served meanwhile."""
+        numbers, sent = collections.Counter(), 1200
+
+        def read(server):
+            while datagram := server.recv(4096):
+                if b" number=" in datagram:
+                    numbers[int(datagram.rpartition(b"=")[2])] += 1
+                    events.add(datagram[60:62])
+        events = set()
+        with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as server, \
+                self.serving(wrapper=("prlimit", "--nofile=1024:1024")) as daemon:
+            server.bind(("127.0.0.1", 0))  # it reads, and acknowledges nothing
+            reader = threading.Thread(target=read, args=(server,), daemon=True)
+            reader.start()
+            self.report_to(port=server.getsockname()[1], reliable=500)
+
+            def sockets():
+                lines = pathlib.Path(f"/proc/{daemon.popen.pid}/net/udp").read_text().splitlines()[1:]
+                udp = {f"socket:[{line.split()[9]}]" for line in lines}
+                links = pathlib.Path(f"/proc/{daemon.popen.pid}/fd").iterdir()
+                return sum(os.path.islink(link) and os.readlink(link) in udp for link in links)
+            wire = Wire(self.root)
+            for number in range(sent):
+                answer = wire.call(ONE_SHOT, category=5, type=2, payload={"number": number},
+                                   sessionInfo={"clientType": 7, "sessionID": number, "requireUserInfo": True},
+                                   userInfo={"clientName": "phone"})
+                self.assertEqual(answer["results"]["reply"], "finished")
+            self.assertEqual(sockets(), 1)
+            for _ in range(100):
+                self.client().close()
+            daemon.wait_for_line("dealloc: VeltradSession dealloc", 100)
+            begin = time.monotonic()
+            self.client().close()
+            self.assertLess(time.monotonic() - begin, 1)
+            wait_until(lambda: sockets() <= 65, "the oldest that lingered have ended")
+            wait_until(lambda: sockets() == 0, "all have ended")
+            wire.close()
+            server.sendto(b"", server.getsockname())  # ends the reader
+            reader.join(DEADLINE)
+        self.assertEqual((sorted(numbers), events), (list(range(sent)), {b"\0\1"}))
 
     def test_the_end_waits_for_acknowledgements_but_not_for_ever(self):
         self.report_to(reliable=PERIOD)

@@ -4,13 +4,17 @@
 #include <endian.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
+#include <utility>
 
+#include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
 #include "backends/dashboard/text_line.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
 #include "platform/log.h"
+#include "platform/memory_budget.h"
 
 namespace veltrad {
 
@@ -28,109 +32,130 @@ std::chrono::milliseconds periodOf(const Dictionary* profile) {
   return asked > 0 ? std::chrono::milliseconds(asked) : kDefaultPeriod;
 }
 
-std::optional<sockaddr_in> addressOf(const std::string& ip, std::uint16_t port) {
-  const auto address = platform::parseIPv4Address(ip, port);
-  if (!address) logError("DashboardBackend(initWithName): can't resolve server IP");
-  return address;
+bool namesServer(const Dictionary& profile) {
+  const bool ip = profile.string("ip");
+  const bool port = profile.uint16("port").has_value();
+  if (!ip || !port) {
+    logError("DashboardBackend(initWithName): can't resolve server %s", ip ? "port" : "IP");
+  }
+  return ip && port;
 }
 
-// Of the section's server.
-std::optional<sockaddr_in> addressOf(const Dictionary& profile) {
-  const std::string* ip = profile.string("ip");
-  if (!ip) {
+// One more socket; those that linger for others make room for it.
+std::optional<platform::UDPSocket> openSocket(DashboardQueues& queues) {
+  for (;;) {
+    auto socket = platform::UDPSocket::open();
+    if (socket.ok()) return std::move(socket).value();
+    const bool tableIsFull = socket.error() == EMFILE || socket.error() == ENFILE;
+    if (tableIsFull && queues.endOldest()) continue;
+    logError("DashboardBackend(initWithName): socket() failed (%d)", socket.error());
+    return std::nullopt;
+  }
+}
+
+bool useReliableUDP(platform::UDPSocket& socket) {
+  const auto failure = socket.bindToAnyPort();
+  if (failure) logError("DashboardBackend(useReliableUDP): can't bind socket, %d", *failure);
+  return !failure;
+}
+
+// Where to, and how; the address is missing where its text names none.
+struct Server {
+  std::optional<sockaddr_in> address;
+  bool reliable = true;
+  std::chrono::milliseconds period = kDefaultPeriod;
+
+  DashboardQueues::Route routeOf(const BackendOwner& owner) const {
+    const auto user = owner.account ? std::int64_t{owner.account->uid()} : DashboardQueues::kNobody;
+    return {address->sin_addr.s_addr, address->sin_port, reliable, period, user};
+  }
+};
+
+Server serverOf(const Dictionary* profile, const std::optional<std::string>& serverIP,
+                std::uint16_t serverPort) {
+  if (!profile) return {serverIP ? platform::parseIPv4Address(*serverIP, serverPort) : std::nullopt};
+  return {platform::parseIPv4Address(*profile->string("ip"), *profile->uint16("port")),
+          profile->contains("reliable"), periodOf(profile)};
+}
+
+// Null: one error line has said why.
+std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, platform::UDPSocket socket,
+                                            const Server& server) {
+  if (!server.address) {
     logError("DashboardBackend(initWithName): can't resolve server IP");
-    return std::nullopt;
+    return nullptr;
   }
-  const auto port = profile.uint16("port");
-  if (!port) {
-    logError("DashboardBackend(initWithName): can't resolve server port");
-    return std::nullopt;
+  const bool reliable = server.reliable && useReliableUDP(socket);
+  if (socket.connect(*server.address)) {
+    logError("DashboardBackend(initWithName): socket connect() failed.");
+    return nullptr;
   }
-  return addressOf(*ip, *port);
+  platform::WorkPool& pool = making.services.pool;
+  auto timer = platform::PoolTimer::make(pool);
+  if (!timer) {
+    logError("DashboardBackend(initWithName): can't create timer source.");
+    return nullptr;
+  }
+  const NetworkProcQueue::Kind kind{reliable, making.owner.oneShot, server.period};
+  const auto queue =
+      std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.owner.account,
+                                         making.queues, making.services.counters);
+  if (reliable && !queue->startReading(pool)) {
+    logError("DashboardBackend(useReliableUDP): can't create read source");
+  }
+  if (kind.shared) making.queues->share(server.routeOf(making.owner), queue);
+  return queue;
 }
 }  // namespace
 
-std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const BackendServices& services,
-                                                                 LogDataUploads& uploads,
+std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
                                                                  const std::string& name,
                                                                  const Dictionary* profile,
                                                                  const std::string& productFamily) {
   const auto port = profile ? profile->uint16("port").value_or(0) : std::uint16_t{0};
-  return initWithName(services, uploads, name, profile, textOf(profile, "ip"), port, productFamily);
+  return initWithName(making, name, profile, textOf(profile, "ip"), port, productFamily);
 }
 
-std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
-    const BackendServices& services, LogDataUploads& uploads, const std::string& name,
-    const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
+std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
+                                                                 const std::string& name,
+                                                                 const std::optional<std::string>& serverIP,
+                                                                 std::uint16_t serverPort,
+                                                                 const std::string& productFamily) {
   if (!serverIP) return nullptr;
-  return initWithName(services, uploads, name, nullptr, serverIP, serverPort, productFamily);
+  return initWithName(making, name, nullptr, serverIP, serverPort, productFamily);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
-    const BackendServices& services, LogDataUploads& uploads, const std::string& name,
-    const Dictionary* profile, const std::optional<std::string>& serverIP, std::uint16_t serverPort,
-    const std::string& productFamily) {
-  auto network = openNetwork(services, profile, serverIP, serverPort);
-  if (!network) return nullptr;
-  std::shared_ptr<DashboardBackend> backend(
-      new DashboardBackend(services, uploads, name, profile, productFamily, std::move(*network)));
+    const DashboardMaking& making, const std::string& name, const Dictionary* profile,
+    const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
+  if (profile && !namesServer(*profile)) return nullptr;
+  const Server server = serverOf(profile, serverIP, serverPort);
+  auto queue =
+      making.owner.oneShot && server.address ? making.queues->join(server.routeOf(making.owner)) : nullptr;
+  auto socket = queue ? std::nullopt : openSocket(*making.queues);
+  if (!queue && !socket) return nullptr;
+  std::shared_ptr<DashboardBackend> backend(new DashboardBackend(making, name, profile, productFamily));
   backend->setDisplayURL(textOf(profile, "display_url"));
-  return backend;
-}
-
-DashboardBackend::DashboardBackend(const BackendServices& services, LogDataUploads& uploads,
-                                   const std::string& name, const Dictionary* profile,
-                                   const std::string& productFamily, Network network)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
-      _uploads(uploads),
-      _clock(services.clock),
-      _counters(services.counters),
-      _reliableUDP(network.reliableUDP),
-      _usingProfile(profile != nullptr),
-      _postURL(textOf(profile, "post_url")),
-      _networkProcQueue(std::move(network.queue)) {}
-
-DashboardBackend::~DashboardBackend() {
-  _networkProcQueue->cleanup();
-}
-
-std::optional<DashboardBackend::Network> DashboardBackend::openNetwork(
-    const BackendServices& services, const Dictionary* profile, const std::optional<std::string>& serverIP,
-    std::uint16_t serverPort) {
   if (!profile && !serverIP) {
     logError("DashboardBackend(initWithName): initWitName with all null params.");
-    return std::nullopt;
+    return nullptr;
   }
-  const auto address = profile ? addressOf(*profile) : addressOf(*serverIP, serverPort);
-  if (!address) return std::nullopt;
-  auto socket = platform::UDPSocket::open();
-  if (!socket.ok()) {
-    logError("DashboardBackend(initWithName): socket() failed (%d)", socket.error());
-    return std::nullopt;
-  }
-  Network network;
-  if (!profile || profile->contains("reliable")) network.reliableUDP = useReliableUDP(socket.value());
-  if (socket.value().connect(*address)) {
-    logError("DashboardBackend(initWithName): socket connect() failed.");
-    return std::nullopt;
-  }
-  auto timer = platform::PoolTimer::make(services.pool);
-  if (!timer) {
-    logError("DashboardBackend(initWithName): can't create timer source.");
-    return std::nullopt;
-  }
-  network.queue = std::make_shared<NetworkProcQueue>(
-      std::move(socket).value(), std::move(timer), network.reliableUDP, periodOf(profile), services.counters);
-  if (network.reliableUDP && !network.queue->startReading(services.pool)) {
-    logError("DashboardBackend(useReliableUDP): can't create read source");
-  }
-  return network;
+  if (!queue) queue = openQueue(making, std::move(*socket), server);
+  backend->_networkProcQueue = std::move(queue);
+  return backend->_networkProcQueue ? backend : nullptr;
 }
 
-bool DashboardBackend::useReliableUDP(platform::UDPSocket& socket) {
-  const auto failure = socket.bindToAnyPort();
-  if (failure) logError("DashboardBackend(useReliableUDP): can't bind socket, %d", *failure);
-  return !failure;
+DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::string& name,
+                                   const Dictionary* profile, const std::string& productFamily)
+    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, making.services.random),
+      _uploads(making.uploads),
+      _clock(making.services.clock),
+      _counters(making.services.counters),
+      _usingProfile(profile != nullptr),
+      _postURL(textOf(profile, "post_url")) {}
+
+DashboardBackend::~DashboardBackend() {
+  cleanup();
 }
 
 std::optional<std::string> DashboardBackend::sendMessage(const Dictionary* payload,
@@ -164,8 +189,9 @@ tagReportingPacketHeader DashboardBackend::headerOf(platform::TimeValue timestam
   header.respCode = htobe16(respCode);
   std::memcpy(header.deviceID, udid().data(), std::min(udid().size(), sizeof header.deviceID));
   header.eventID = htobe16(eventID);
-  header.flags = htobe16(static_cast<std::uint16_t>((_reliableUDP ? kPacketFlagReliable : 0) |
-                                                    (_usingProfile ? 0 : kPacketFlagNoProfile)));
+  header.flags =
+      htobe16(static_cast<std::uint16_t>((_networkProcQueue->reliableUDP() ? kPacketFlagReliable : 0) |
+                                         (_usingProfile ? 0 : kPacketFlagNoProfile)));
   return header;
 }
 
@@ -178,6 +204,7 @@ bool DashboardBackend::uploadLogData(const Array& logData) {
 }
 
 void DashboardBackend::cleanup() {
+  if (!_networkProcQueue || std::exchange(_cleanedUp, true)) return;
   _networkProcQueue->cleanup();
 }
 

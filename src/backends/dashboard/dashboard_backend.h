@@ -14,7 +14,16 @@
 
 namespace veltrad {
 
+class DashboardQueues;
 class LogDataUploads;
+
+// What a dashboard back end is made from. The services and the uploads outlive it.
+struct DashboardMaking {
+  const BackendServices& services;
+  LogDataUploads& uploads;
+  std::shared_ptr<DashboardQueues> queues;
+  BackendOwner owner;
+};
 
 // Null from an initialiser: it cannot work so; one error line has said why.
 class DashboardBackend final : public VeltraBackend {
@@ -22,20 +31,18 @@ class DashboardBackend final : public VeltraBackend {
   // From a storebag's section: "ip" (dotted-decimal IPv4), "port", and where given "display_url", "post_url"
   // (for log data) and "reliable": present switches acknowledgements on; its value, from 1 on, is the period
   // of the ticks in milliseconds, else 500.
-  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        LogDataUploads& uploads, const std::string& name,
-                                                        const Dictionary* profile,
+  static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
+                                                        const std::string& name, const Dictionary* profile,
                                                         const std::string& productFamily);
   // To a server named outright, with acknowledgements and a period of 500 ms.
-  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        LogDataUploads& uploads, const std::string& name,
+  static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
+                                                        const std::string& name,
                                                         const std::optional<std::string>& serverIP,
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
   // A profile goes before the server named.
-  static std::shared_ptr<DashboardBackend> initWithName(const BackendServices& services,
-                                                        LogDataUploads& uploads, const std::string& name,
-                                                        const Dictionary* profile,
+  static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
+                                                        const std::string& name, const Dictionary* profile,
                                                         const std::optional<std::string>& serverIP,
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
@@ -50,29 +57,22 @@ class DashboardBackend final : public VeltraBackend {
   void cleanup() override;
 
  private:
-  struct Network {
-    std::shared_ptr<NetworkProcQueue> queue;
-    bool reliableUDP = false;
-  };
+  DashboardBackend(const DashboardMaking& making, const std::string& name, const Dictionary* profile,
+                   const std::string& productFamily);
 
-  DashboardBackend(const BackendServices& services, LogDataUploads& uploads, const std::string& name,
-                   const Dictionary* profile, const std::string& productFamily, Network network);
-
-  static std::optional<Network> openNetwork(const BackendServices& services, const Dictionary* profile,
-                                            const std::optional<std::string>& serverIP,
-                                            std::uint16_t serverPort);
-  static bool useReliableUDP(platform::UDPSocket& socket);
   tagReportingPacketHeader headerOf(platform::TimeValue timestamp, std::uint16_t method,
                                     std::uint16_t respCode, std::uint16_t eventID) const;
 
-  // Constant after construction.
+  // Constant after initialisation.
   LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
-  const bool _reliableUDP;
   const bool _usingProfile;
   const std::optional<std::string> _postURL;
-  const std::shared_ptr<NetworkProcQueue> _networkProcQueue;
+  std::shared_ptr<NetworkProcQueue> _networkProcQueue;  // null: not initialised
+
+  // The session's thread only.
+  bool _cleanedUp = false;
 };
 
 }  // namespace veltrad

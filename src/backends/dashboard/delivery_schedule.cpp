@@ -18,6 +18,11 @@ DeliverySchedule::Verdict DeliverySchedule::cleanup(bool waiting) {
   return Verdict::goOn;
 }
 
+void DeliverySchedule::resume() {
+  _cleanupState = notRequested;
+  _lastResort = std::nullopt;
+}
+
 DeliverySchedule::Verdict DeliverySchedule::afterTick(Time now, bool waiting) {
   if (_cleanupState == notRequested) return Verdict::goOn;
   if (!waiting) return Verdict::stop;

@@ -25,6 +25,8 @@ class DeliverySchedule {
 
   // The session lets go: stop when nothing waits, else when nothing waits any more.
   Verdict cleanup(bool waiting);
+  // Somebody sends again: no clean-up is under way any more.
+  void resume();
   // At the end of every tick.
   Verdict afterTick(Time now, bool waiting);
 

@@ -10,31 +10,53 @@ namespace {
 // Ticks before a retransmission, by the retransmissions done so far.
 constexpr int checksBeforeRetransmit[] = {2, 3, 5, 9};
 constexpr int kMostRetransmits = static_cast<int>(std::size(checksBeforeRetransmit));
+static_assert(checksBeforeRetransmit[kMostRetransmits - 1] == SentCopies::kTicks);
+// Five transmissions of each that waits, and as many again of those that have gone.
+constexpr std::size_t kMostCopies = MessageQueue::maxPendingSharedPackets * 2 * (kMostRetransmits + 1);
 }  // namespace
 
-MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
-  First result{_send(datagram), false};
+MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send)
+    : _reliableUDP(reliableUDP),
+      _most(shared ? maxPendingSharedPackets : maxPendingPackets),
+      _send(std::move(send)) {
+  if (shared) _copies.emplace(kMostCopies);
+}
+
+MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
+                                               std::optional<platform::Charge> charge) {
+  First result;
+  result.sent = _send(datagram);
   if (result.sent && !_reliableUDP) return result;
-  _pending.emplace_back(datagram, eventNumber);
-  if (result.sent) _pending.back().setState(UDPPacketToSend::awaitsAcknowledgement);
-  if (_pending.size() > maxPendingPackets) {
-    _pending.erase(_pending.begin());
-    result.pushedOut = true;
+  result.notKept = !charge;
+  if (!charge) return result;
+  auto& record = _pending.emplace_back(datagram, eventNumber, ++_lastSerial, std::move(*charge));
+  if (result.sent) {
+    record.setState(UDPPacketToSend::awaitsAcknowledgement);
+    if (_copies) _copies->sent(record.serial(), eventNumber);
   }
+  result.pushedOut = _pending.size() > _most;
+  if (result.pushedOut) _pending.pop_front();
   return result;
 }
 
 MessageQueue::Tick MessageQueue::tick() {
   Tick result;
+  if (_copies) _copies->tick();
   for (auto record = _pending.begin(); record != _pending.end();) {
-    record = check(*record, result) ? _pending.erase(record) : record + 1;
+    record = check(*record, result) ? _pending.erase(record) : std::next(record);
   }
   return result;
 }
 
+bool MessageQueue::send(const UDPPacketToSend& record) {
+  if (!_send(record.data())) return false;
+  if (_copies && _reliableUDP) _copies->sent(record.serial(), record.eventNumber());
+  return true;
+}
+
 bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (record.state() == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
-  if (!_send(record.data())) return false;
+  if (!send(record)) return false;
   ++result.sent;
   record.setState(UDPPacketToSend::awaitsAcknowledgement);
   return !_reliableUDP;
@@ -49,7 +71,7 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   const int checks = record.numberOfChecks() + 1;
   if (checks < checksBeforeRetransmit[retransmits]) {
     record.setNumberOfChecks(checks);
-  } else if (_send(record.data())) {
+  } else if (send(record)) {
     record.setNumberOfChecks(0);
     record.setNumberOfRetransmits(retransmits + 1);
     ++result.sentAgain;
@@ -64,8 +86,9 @@ std::size_t MessageQueue::notSent() const {
 }
 
 bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
+  const auto answered = _copies ? _copies->answered(eventNumber) : std::nullopt;
   const auto record = std::find_if(_pending.begin(), _pending.end(), [&](const UDPPacketToSend& one) {
-    return one.eventNumber() == eventNumber;
+    return _copies ? answered == one.serial() : one.eventNumber() == eventNumber;
   });
   if (record == _pending.end()) return false;
   _pending.erase(record);

@@ -5,6 +5,7 @@
 
 #include <cstring>
 
+#include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/reporting_packet.h"
 #include "platform/counters.h"
 #include "platform/log.h"
@@ -15,6 +16,10 @@ namespace {
 constexpr std::string_view kLost = "datagram lost: its back end ended before it was sent";
 constexpr int kMostReadAtOnce = 64;  // then the pool's other handlers have their turn
 constexpr std::size_t kEventIDAt = offsetof(tagReportingPacketHeader, eventID);
+// What a datagram that waits keeps beside its bytes: the record, its place in the list, the copies that are
+// remembered. What a socket keeps: its objects, the timer and the read source with it.
+constexpr std::size_t kDatagramBytes = 512;
+constexpr std::size_t kSocketBytes = 8192;
 
 DeliverySchedule::Time now() {
   return std::chrono::steady_clock::now();
@@ -22,21 +27,21 @@ DeliverySchedule::Time now() {
 }  // namespace
 
 NetworkProcQueue::NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<platform::PoolTimer> timer,
-                                   bool reliableUDP, std::chrono::milliseconds period,
-                                   platform::Counters& counters)
+                                   const Kind& kind, std::shared_ptr<platform::MemoryAccount> account,
+                                   std::shared_ptr<DashboardQueues> queues, platform::Counters& counters)
     : _counters(counters),
+      _kind(kind),
+      _account(std::move(account)),
+      _queues(std::move(queues)),
       _socket(std::move(socket)),
-      _messageQueue(reliableUDP,
+      _messageQueue(kind.reliableUDP, kind.shared,
                     [this](std::string_view datagram) REQUIRES(_mutex) { return _socket.send(datagram); }),
-      _schedule(now(), period),
+      _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
 NetworkProcQueue::~NetworkProcQueue() {
   const Lock held(_mutex);
-  const std::size_t notSent = _messageQueue.notSent();
-  _counters.count(kLost, notSent);
-  _counters.count("datagram given up: not acknowledged before its back end ended",
-                  _messageQueue.size() - notSent);
+  giveUp("datagram given up: not acknowledged before its back end ended");
   _readSource.reset();  // before the socket that it watches
 }
 
@@ -48,20 +53,74 @@ bool NetworkProcQueue::startReading(platform::WorkPool& pool) {
 }
 
 void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
+  auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
     _counters.count(kLost);
     return;
   }
-  const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber);
-  _counters.count(first.sent ? "datagram sent" : "datagram held: the socket did not take it");
-  if (first.pushedOut) _counters.count("datagram dropped: 50 later ones wait");
+  const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
+  if (first.sent) _counters.count("datagram sent");
+  if (!first.sent && !first.notKept) _counters.count("datagram held: the socket did not take it");
+  if (first.notKept) {
+    _counters.count(first.sent ? "datagram given up: no memory to await its acknowledgement"
+                               : "datagram lost: the socket did not take it, and no memory to hold it");
+  }
+  if (first.pushedOut) {
+    _counters.count(_kind.shared ? "datagram dropped: 1024 later ones wait"
+                                 : "datagram dropped: 50 later ones wait");
+  }
   if (!_armed) armTimer(now());
 }
 
-void NetworkProcQueue::cleanup() {
+// Events that wait in a batch make room for a datagram that is to be acknowledged, but not for one that most
+// likely need not wait at all.
+std::optional<platform::Charge> NetworkProcQueue::chargeFor(std::size_t datagram) const {
+  if (!_account) return platform::Charge();
+  const std::size_t bytes = datagram + kDatagramBytes;
+  return _kind.reliableUDP ? _account->keep(bytes) : _account->tryCharge(bytes, platform::MemoryUse::kept);
+}
+
+bool NetworkProcQueue::join() {
   const Lock held(_mutex);
-  if (_schedule.cleanup(!_messageQueue.empty()) == DeliverySchedule::Verdict::stop) cleanupSources();
+  if (!_timer) return false;
+  ++_backEnds;
+  _schedule.resume();
+  return true;
+}
+
+void NetworkProcQueue::cleanup() {
+  {
+    const Lock held(_mutex);
+    if (--_backEnds > 0) return;
+    if (_schedule.cleanup(!_messageQueue.empty()) == DeliverySchedule::Verdict::stop) return cleanupSources();
+    if (!chargeSocket()) {
+      giveUp("datagram given up: no memory for its dashboard after its session");
+      return cleanupSources();
+    }
+  }
+  _queues->lingers(shared_from_this(), _account ? std::int64_t{_account->uid()} : DashboardQueues::kNobody);
+}
+
+bool NetworkProcQueue::chargeSocket() {
+  if (!_account || _socketCharge) return true;
+  _socketCharge = _account->tryCharge(kSocketBytes, platform::MemoryUse::kept);
+  return _socketCharge.has_value();
+}
+
+void NetworkProcQueue::end() {
+  const Lock held(_mutex);
+  if (_backEnds > 0 || !_timer) return;
+  giveUp("datagram given up: too many dashboards waited after their sessions");
+  cleanupSources();
+}
+
+// `reason`: of those that went out.
+void NetworkProcQueue::giveUp(std::string_view reason) {
+  const std::size_t notSent = _messageQueue.notSent();
+  _counters.count(kLost, notSent);
+  _counters.count(reason, _messageQueue.size() - notSent);
+  _messageQueue.clear();
 }
 
 void NetworkProcQueue::armTimer(DeliverySchedule::Time time) {
@@ -132,6 +191,7 @@ void NetworkProcQueue::cleanupSources() {
   _armed = false;
   _readSource.reset();
   _socket.close();
+  _socketCharge.reset();
 }
 
 }  // namespace veltrad

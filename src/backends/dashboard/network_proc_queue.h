@@ -3,42 +3,59 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <optional>
 #include <string_view>
 
 #include "backends/dashboard/delivery_schedule.h"
 #include "backends/dashboard/message_queue.h"
 #include "base/mutex.h"
+#include "platform/memory_budget.h"
 #include "platform/pool_timer.h"
 #include "platform/read_source.h"
 #include "platform/udp_socket.h"
 
 namespace veltrad {
 
+class DashboardQueues;
 namespace platform {
 class Counters;
 class WorkPool;
 }  // namespace platform
 
 // A serial queue: one thing at a time, in the order in which it came, on the thread that brings it; a first
-// transmission never blocks and costs no change of thread. The armed timer keeps it alive after its back end
-// until nothing waits or the last resort; the socket is closed then, or with the object, once. `counters`
-// must outlive it.
+// transmission never blocks and costs no change of thread. The armed timer keeps it alive after its back ends
+// (one, or those of one-shot messages) until nothing waits, the last resort, or end(); the socket is closed
+// then, or with the object, once. What waits is charged to the user, and the socket when it outlives its back
+// ends. `counters` must outlive it.
 class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQueue> {
  public:
-  // `socket` is connected.
-  NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<platform::PoolTimer> timer, bool reliableUDP,
-                   std::chrono::milliseconds period, platform::Counters& counters);
+  struct Kind {
+    bool reliableUDP = false;
+    bool shared = false;  // by one-shot messages
+    std::chrono::milliseconds period{};
+  };
+  // For one back end. `socket` is connected. `account`: null, nobody pays.
+  NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<platform::PoolTimer> timer, const Kind& kind,
+                   std::shared_ptr<platform::MemoryAccount> account, std::shared_ptr<DashboardQueues> queues,
+                   platform::Counters& counters);
   // Counts the datagrams that still wait as lost.
   ~NetworkProcQueue();
 
   // Acknowledgements are read from now on; false: they cannot be.
   bool startReading(platform::WorkPool& pool);
+  // No lock is held: older things of the user may have to make room.
   void tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
-  // Stops at once when nothing waits, else when nothing waits any more, 9.5 s after the next tick at the
-  // latest.
+  // One back end more, which calls cleanup(); false: it has stopped already.
+  bool join();
+  // One back end lets go. With the last it stops: at once when nothing waits, else when nothing waits any
+  // more, 9.5 s after the next tick at the latest.
   void cleanup();
+  // Others need the room: what waits is given up, unless a back end has come since.
+  void end();
+  bool reliableUDP() const { return _kind.reliableUDP; }
 
  private:
   void timerFired();
@@ -48,9 +65,16 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
+  std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
+  // False: there is no room for a socket that outlives its back ends.
+  bool chargeSocket() REQUIRES(_mutex);
+  void giveUp(std::string_view reason) REQUIRES(_mutex);
 
   // Constant after construction.
   platform::Counters& _counters;
+  const Kind _kind;
+  const std::shared_ptr<platform::MemoryAccount> _account;
+  const std::shared_ptr<DashboardQueues> _queues;
 
   Mutex _mutex BACKEND_LOCK{LockRank::backend};
   platform::UDPSocket _socket GUARDED_BY(_mutex);
@@ -58,6 +82,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   DeliverySchedule _schedule GUARDED_BY(_mutex);
   std::unique_ptr<platform::PoolTimer> _timer GUARDED_BY(_mutex);  // null: stopped
   bool _armed GUARDED_BY(_mutex) = false;
+  std::size_t _backEnds GUARDED_BY(_mutex) = 1;
+  std::optional<platform::Charge> _socketCharge GUARDED_BY(_mutex);
   std::unique_ptr<platform::ReadSource> _readSource GUARDED_BY(_mutex);
 };
 

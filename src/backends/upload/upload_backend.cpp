@@ -30,7 +30,6 @@ FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account
 const char* fateAfter(platform::HTTPError::Kind kind) {
   switch (kind) {
     case platform::HTTPError::Kind::transport:
-    case platform::HTTPError::Kind::tooLarge:
       return "file lost: the exchange with the server failed";
     case platform::HTTPError::Kind::tooLarge:
       return "file lost: the server's answer is too large";

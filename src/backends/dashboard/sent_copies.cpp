@@ -1,0 +1,27 @@
+// Copies in the order in which they went out.
+#include "backends/dashboard/sent_copies.h"
+
+#include <algorithm>
+
+namespace veltrad {
+
+void SentCopies::sent(std::uint64_t datagram, std::uint16_t eventNumber) {
+  _copies.push_back({datagram, _tick, eventNumber});
+  if (_copies.size() > _most) _copies.pop_front();
+}
+
+std::optional<std::uint64_t> SentCopies::answered(std::uint16_t eventNumber) {
+  const auto copy = std::find_if(_copies.begin(), _copies.end(),
+                                 [&](const Copy& one) { return one.eventNumber == eventNumber; });
+  if (copy == _copies.end()) return std::nullopt;
+  const std::uint64_t datagram = copy->datagram;
+  _copies.erase(copy);
+  return datagram;
+}
+
+void SentCopies::tick() {
+  ++_tick;
+  while (!_copies.empty() && _tick - _copies.front().tick > kTicks) _copies.pop_front();
+}
+
+}  // namespace veltrad
