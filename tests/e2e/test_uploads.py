@@ -219,12 +219,13 @@ class Uploads(SystemTest):
             self.assertEqual(session.close(), 0)
 
     def test_a_stop_waits_for_no_upload(self):
-        with self.serving("The daemon is stopping", "File upload failed"):
+        with self.serving("The daemon is stopping", "File upload failed") as daemon:
             self.lab.control(path="/upload", stall=True)
             sessions = [self.open(session_id=number)[0] for number in range(4)]
             for number, session in enumerate(sessions):
                 session.say(op="uploadFile", path=os.fsdecode(self.make(str(number))))
             self.lab.received("uploads", 2)
+            daemon.wait_for_line("uploadFileAtPath: Uploading file for session", 4)
         self.assertEqual(sorted(session.answer()["uploaded"] for session in sessions), [False, False, True, True])
         self.assertEqual(len(os.listdir(self.files)), 4)
         self.assertEqual(self.fates(), {"file lost: the daemon is stopping": 4})
