@@ -29,7 +29,9 @@ constexpr int kCallsARound = 200;
 
 class EchoingSession final : public ClientSessionInterface {
  public:
-  void setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {}
+  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+    return true;
+  }
   void startConfigWithCompletionHandler(NamesReply) override {}
   void fetchStatesWithUserInfo(OptionalDictionary, NamesReply) override {}
   void fetchDisplayURL(StringReply) override {}

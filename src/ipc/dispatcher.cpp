@@ -41,8 +41,12 @@ Refusal setSessionInfo(Call& call) {
   const bool aggregates = call.arguments.boolean("hasAggregationBlock").value_or(false);
   auto sessionInfo = takenDictionary(call, "sessionInfo");
   auto userInfo = takenDictionary(call, "userInfo");
-  call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
-                              takenArray(call, "frameworksToCheck"), aggregates);
+  const bool described = call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
+                                                     takenArray(call, "frameworksToCheck"), aggregates);
+  if (!described && call.pending) {
+    call.pending->fail(makeReportingError(
+        "The session's description is more than the daemon may keep for its user; try again later.", -1));
+  }
   // Nothing comes back but the word that it was done.
   if (call.pending) call.pending->answer({});
   return std::nullopt;

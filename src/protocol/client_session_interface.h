@@ -30,7 +30,8 @@ class ClientSessionInterface {
  public:
   virtual ~ClientSessionInterface() = default;
 
-  virtual void setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+  // False: the daemon may not keep so much for the client's user; nothing has changed.
+  virtual bool setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                               std::optional<Array> frameworksToCheck, bool hasAggregationBlock) = 0;
   virtual void startConfigWithCompletionHandler(NamesReply completionHandler) = 0;
   virtual void fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) = 0;

@@ -227,9 +227,12 @@ void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, Optiona
     return;  // the reply is never given, which ends the client's call
   }
   _sessionID.store(info->uint32(kVeltraSessionInfoSessionID).value_or(0), std::memory_order_relaxed);
-  const auto kept = std::make_shared<const Dictionary>(std::move(*info));
-  const SharedDictionary identity =
-      userInfo ? std::make_shared<const Dictionary>(std::move(*userInfo)) : nullptr;
+  SharedDictionary kept;
+  SharedDictionary identity;
+  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
+    _services.counters.count("message dropped: its user keeps too much");
+    return;
+  }
   keepSessionInfo(kept);
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());

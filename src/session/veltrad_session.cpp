@@ -9,6 +9,7 @@
 #include "platform/uuid.h"
 #include "protocol/connection.h"
 #include "protocol/constants.h"
+#include "session/kept_info.h"
 #include "session/session_delegate.h"
 #include "session/start_message.h"
 #include "support/device_identity.h"
@@ -16,10 +17,6 @@
 namespace veltrad {
 
 namespace {
-SharedDictionary shared(OptionalDictionary dictionary) {
-  return dictionary ? std::make_shared<const Dictionary>(std::move(*dictionary)) : nullptr;
-}
-
 // String equality of the names that make an identity; a name missing on the new side counts as a change.
 bool sameName(const Dictionary& current, const Dictionary& updated, const char* key) {
   const std::string* before = current.string(key);
@@ -89,19 +86,29 @@ std::optional<std::int32_t> VeltradSession::clientType() const {
   return info ? info->int32(kVeltraSessionInfoClientType) : std::nullopt;
 }
 
-void VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+bool VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                                     std::optional<Array>, bool hasAggregationBlock) {
-  const std::uint32_t number = sessionInfo ? sessionInfo->uint32(kVeltraSessionInfoSessionID).value_or(0) : 0;
+  SharedDictionary info;
+  SharedDictionary identity;
+  if (!charged(std::move(sessionInfo), info) || !charged(std::move(userInfo), identity)) return false;
+  const std::uint32_t number = info ? info->uint32(kVeltraSessionInfoSessionID).value_or(0) : 0;
   _sessionID.store(number, std::memory_order_relaxed);
   logDebug("setSessionInfo: Configuring session %u", number);
-  const bool required =
-      sessionInfo && sessionInfo->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false);
-  if (userInfo && !required) {
+  const bool required = info && info->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false);
+  if (identity && !required) {
     logWarning("setSessionInfo: Configure session: user info provided without requiring it");
   }
-  keepSessionInfo(shared(std::move(sessionInfo)));
-  keepUserInfo(shared(std::move(userInfo)));
+  keepSessionInfo(std::move(info));
+  keepUserInfo(std::move(identity));
   _hasAggregator.store(hasAggregationBlock, std::memory_order_relaxed);
+  return true;
+}
+
+bool VeltradSession::charged(OptionalDictionary given, SharedDictionary& kept) {
+  if (!given) return true;
+  kept = keptInfo(std::move(*given), _account);
+  if (!kept) _services.counters.count("session or user info refused: its user keeps too much");
+  return kept != nullptr;
 }
 
 void VeltradSession::keepSessionInfo(SharedDictionary info) {
@@ -192,7 +199,8 @@ std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() c
 
 void VeltradSession::fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) {
   logDebug("fetchStatesWithUserInfo: Fetching states for session %u", sessionID());
-  receivedUserInfo(shared(std::move(userInfo)));
+  SharedDictionary identity;
+  if (charged(std::move(userInfo), identity)) receivedUserInfo(std::move(identity));
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 

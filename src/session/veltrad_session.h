@@ -53,7 +53,7 @@ class VeltradSession final : public ClientSessionInterface,
   ~VeltradSession() override;
 
   // The frameworks are not looked at.
-  void setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+  bool setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                       std::optional<Array> frameworksToCheck, bool hasAggregationBlock) override;
   void startConfigWithCompletionHandler(NamesReply completionHandler) override;
   void fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) override;
@@ -105,6 +105,8 @@ class VeltradSession final : public ClientSessionInterface,
   void refreshStates();
   void receivedUserInfo(SharedDictionary userInfo);
   // What is kept for the session's life goes through these two.
+  // What will be kept of it; false: too much, which is said and counted.
+  bool charged(OptionalDictionary given, SharedDictionary& kept);
   void keepSessionInfo(SharedDictionary info);
   void keepUserInfo(SharedDictionary info);
   // Through the checks to the aggregating client and every backend; the answer for the client, or none.
@@ -137,7 +139,7 @@ class VeltradSession final : public ClientSessionInterface,
   const std::shared_ptr<platform::MemoryAccount> _account;  // null: nobody pays
 
   // The connection's thread only.
-  char _deviceid[41] = {};           // NUL-terminated; all zero while the device has no identifier
+  char _deviceid[41] = {};            // NUL-terminated; all zero while the device has no identifier
   bool _saidWithoutUserInfo = false;  // since the user info was last given
 
   std::atomic<std::uint32_t> _sessionID{0};

@@ -21,8 +21,9 @@ class AnsweringSession final : public ClientSessionInterface {
  public:
   std::size_t calls = 0;
 
-  void setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
     ++calls;
+    return true;
   }
   void startConfigWithCompletionHandler(NamesReply reply) override {
     answer(reply, std::vector<std::string>{"x"});

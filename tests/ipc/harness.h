@@ -31,7 +31,9 @@ class RecordingSession final : public ClientSessionInterface {
   RecordingSession(Journal& journal, OnMessage onMessage)
       : _journal(journal), _onMessage(std::move(onMessage)) {}
 
-  void setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {}
+  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+    return true;
+  }
   void startConfigWithCompletionHandler(NamesReply) override {}
   void fetchStatesWithUserInfo(OptionalDictionary, NamesReply) override {}
   void fetchDisplayURL(StringReply) override {}

@@ -1,0 +1,36 @@
+// A dictionary and its charge, freed together.
+#include "session/kept_info.h"
+
+#include "platform/memory_budget.h"
+#include "protocol/constants.h"
+
+namespace veltrad {
+
+namespace {
+struct Kept {
+  Dictionary info;
+  platform::Charge charge;
+};
+
+// The lists of identities have keys made of these, each kept three times.
+std::size_t keyBytes(const Dictionary& info) {
+  std::size_t bytes = 0;
+  for (const char* name : {kVeltraUserInfoClientName, kVeltraUserInfoServiceName}) {
+    if (const std::string* text = info.string(name)) bytes += 3 * text->size();
+  }
+  return bytes;
+}
+}  // namespace
+
+SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account) {
+  auto kept = std::make_shared<Kept>();
+  if (account) {
+    auto charge = account->keep(sizeof(Kept) + keptBytes(info) + keyBytes(info));
+    if (!charge) return nullptr;
+    kept->charge = std::move(*charge);
+  }
+  kept->info = std::move(info);
+  return {kept, &kept->info};
+}
+
+}  // namespace veltrad
