@@ -137,7 +137,8 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::u
   // What no event may carry need not be kept until a flush takes it out.
   restrict(event);
   std::optional<std::string> flushed;
-  const HeldEvents::Need need = _held->needOf(method, _eventThreshold, sizeOfEvent(event));
+  const EventSize size = sizeOfEvent(event);
+  const HeldEvents::Need need = _held->needOf(method, _eventThreshold, size);
   if (need == HeldEvents::Need::flush) {
     logDebug(
         "HTTPSPostBackend(batchEvent): Flushing all batched events as we reached event threshold for method "
@@ -148,14 +149,14 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::u
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  const bool kept = keep(std::move(event), method, sessionIDChanges);
+  const bool kept = keep(std::move(event), size, method, sessionIDChanges);
   _services.counters.count(kept ? "event held: batched" : "event dropped: its user keeps too much");
   return flushed;
 }
 
 // False: there is no room for it, even without what the user's other batches hold.
-bool HTTPSPostBackend::keep(Dictionary event, std::int32_t method, std::uint64_t sessionIDChanges) {
-  const EventSize size = sizeOfEvent(event);
+bool HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
+                            std::uint64_t sessionIDChanges) {
   platform::MemoryAccount* account = memoryAccount().get();
   auto charge = account ? account->keep(size.charged) : platform::Charge();
   if (!charge) return false;
