@@ -37,7 +37,10 @@ class Served:
             if code in self.silent or code == FORGET:
                 continue
             error, body = self.answer(code, node, request[40:])
-            os.write(self.device, struct.pack("<IiQ", 16 + len(body), -error, unique) + body)
+            try:
+                os.write(self.device, struct.pack("<IiQ", 16 + len(body), -error, unique) + body)
+            except OSError:  # nobody waits for it any more
+                return
 
     def attributes(self, node):
         mode, size = (0o40755, 0) if node == 1 else (0o100644, len(self.contents[node - 2]))

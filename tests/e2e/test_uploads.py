@@ -312,8 +312,8 @@ class Uploads(SystemTest):
         place = self.root.path / "served"
         place.mkdir()
         served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})
-        self.addCleanup(served.end)
         with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon:
+            self.addCleanup(served.end)  # before the daemon is killed, which may wait for it
             client = Wire(self.root)
             client.describe()
             client.call("startConfigWithCompletionHandler:")
