@@ -7,7 +7,7 @@ Daemon::Daemon(platform::Services& services)
     : _library(services.files, services.preferences, services.root),
       _device(services.device),
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
-      _messageLog(services.clock, services.root.messageLogDirectory()),
+      _messageLog(services.clock, services.root.messageLogDirectory(), services.writer, services.counters),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _device, _library,
                 services.pool, services.lentFiles, services.root.preferencesDirectory()}),

@@ -11,6 +11,7 @@
 #include "daemon/daemon.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
+#include "platform/counters_file.h"
 #include "platform/log.h"
 #include "platform/process_start.h"
 #include "platform/run_loop.h"
@@ -23,7 +24,7 @@ using namespace veltrad;
 using namespace std::chrono_literals;
 
 constexpr auto kStopBound = 10s;  // from the signal to the end of the process
-constexpr auto kTick = 1000ms;    // counters are written and the watchdog is fed this often
+constexpr auto kTick = 1000ms;  // the watchdog is fed, and counters are handed to the disk writer this often
 
 constexpr const char* kHelp =
     "Usage: veltrad [--version | --help]\n"
@@ -88,13 +89,13 @@ std::optional<ipc::ServiceSocket> openSocket(platform::Services& services) {
   return std::move(socket).value();
 }
 
-void serve(platform::Services& services, VeltradAgent& agent, platform::RunLoop& loop) {
-  const double started = platform::timevalToSeconds(services.clock.now());
+void serve(platform::Services& services, VeltradAgent& agent, platform::CountersFile& countersFile,
+           platform::RunLoop& loop) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
   bool used = false;
   loop.run(tick, [&] {
-    services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
+    countersFile.writeSoon();
     const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
     if (used && idle) platform::returnFreeMemory();
     used = !idle;
@@ -102,15 +103,21 @@ void serve(platform::Services& services, VeltradAgent& agent, platform::RunLoop&
   });
 }
 
-// The listener first, so that every session sends its stop message; then what is still to be posted or sent.
-std::size_t stop(platform::Services& services, Listener& listener) {
+// The listener first, so that every session sends its stop message; then what is still to be posted or sent;
+// then what that has left for the disk, the counters last. False: something still runs, so nothing may be
+// destroyed.
+bool stop(platform::Services& services, Listener& listener, platform::CountersFile& countersFile) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
   const std::size_t stuck = listener.invalidate(deadline - 1s);
   services.http.drain(deadline - 500ms);
   services.pool.drain(deadline - 300ms);
-  return stuck;
+  if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited
+  const bool written = countersFile.writeLast(deadline - 100ms);
+  if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
+  if (!written) logWarning("main: the disk did not take everything within the time of a stop");
+  return stuck == 0 && written;
 }
 
 // The status of the process, where the arguments alone decide it.
@@ -153,6 +160,8 @@ int main(int count, char** arguments) {
   if (!socket) return 1;
   removeUnfinishedFiles(services.root);
 
+  platform::CountersFile countersFile(services.counters, services.files, services.writer,
+                                      services.root.countersPath(), started);
   Daemon daemon(services);
   Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
                      services.memory, services.root.entitlementsPath()},
@@ -161,18 +170,12 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), loop);
+  serve(services, daemon.agent(), countersFile, loop);
 
-  const std::size_t stuck = stop(services, listener);
+  const bool ended = stop(services, listener, countersFile);
   daemon.backends().sayRest();
-  if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited
-  services.counters.writeIfChanged(services.files, services.root.countersPath(), started);
-  if (stuck > 0) {
-    logWarning("main: %zu calls did not end within the time of a stop", stuck);
-    platform::VeltraLogging::stopLogging();
-    _exit(0);
-  }
   platform::VeltraLogging::stopLogging();
+  if (!ended) _exit(0);
   platform::allowExit();
   return 0;
 }

@@ -36,6 +36,11 @@ Dictionary Counters::snapshot() const {
   return Dictionary::fromEntries(std::move(entries));
 }
 
+bool Counters::changed() const {
+  Lock lock(_mutex);
+  return _changed;
+}
+
 void Counters::writeIfChanged(FileStore& files, const std::string& path, double startedAt) {
   bool failedBefore = false;
   {

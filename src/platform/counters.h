@@ -21,13 +21,15 @@ class Counters {
   void count(std::string_view reason, std::uint64_t times = 1);
   std::uint64_t value(std::string_view reason) const;
   Dictionary snapshot() const;
+  // Since the last time that they were written.
+  bool changed() const;
 
   // Replaces the file (mode 0644) when something changed since the last time; where that fails, it is tried
-  // again at the next call, with one error line for an episode. The owner calls it at most once a second.
+  // again at the next call, with one error line for an episode. One thread at a time; counters_file.h.
   void writeIfChanged(FileStore& files, const std::string& path, double startedAt);
 
  private:
-  mutable Mutex _mutex{LockRank::leaf};
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::map<std::string, std::uint64_t, std::less<>> _counts GUARDED_BY(_mutex);
   bool _changed GUARDED_BY(_mutex) = true;
   bool _failed GUARDED_BY(_mutex) = false;

@@ -5,6 +5,7 @@
 #include "platform/code_bundle.h"
 #include "platform/counters.h"
 #include "platform/device_properties.h"
+#include "platform/disk_writer.h"
 #include "platform/energy_log.h"
 #include "platform/entitlements.h"
 #include "platform/file_store.h"
@@ -50,6 +51,7 @@ struct Services {
   CurlHTTPClient http;
   WorkPool pool;
   LentFiles lentFiles;
+  DiskWriter writer;
 };
 
 }  // namespace veltrad::platform

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "platform/clock.h"
+#include "platform/counters.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 
@@ -21,6 +22,7 @@ namespace veltrad {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
+constexpr std::size_t kLineBytes = 128;  // what a line that waits keeps beside its text
 
 std::string createdText(const std::optional<double>& created) {
   return created ? dateDescription(*created) : "(null)";
@@ -50,20 +52,39 @@ std::string dateDescription(double secondsSince1970) {
   return {text, length};
 }
 
-MessageLogFile::MessageLogFile(const platform::Clock& clock, std::string directory)
-    : _clock(clock), _directory(std::move(directory)) {}
+MessageLogFile::MessageLogFile(const platform::Clock& clock, std::string directory,
+                               platform::DiskWriter& writer, platform::Counters& counters)
+    : _clock(clock), _directory(std::move(directory)), _counters(counters), _queue(writer, kMostBytes) {}
 
 void MessageLogFile::writeToLogFile(std::string_view format, std::initializer_list<std::string_view> values) {
   const double now = platform::timevalToSeconds(_clock.now());
-  const std::string line = fmt::format("({}) {}\n", dateDescription(now), filledFormat(format, values));
-  const Lock held(_mutex);
-  if (!currentFileIsOpen(now) && !openCurrentFile()) return;
+  std::string line = fmt::format("({}) {}\n", dateDescription(now), filledFormat(format, values));
+  const std::size_t bytes = line.size() + kLineBytes;
+  using Put = platform::DiskWriter::Queue::Put;
+  switch (_queue.put(
+      [this, line = std::move(line)] {
+        if (!append(line)) _counters.count("log line lost: the disk did not take it");
+      },
+      bytes)) {
+    case Put::taken:
+      return;
+    case Put::full:
+      return _counters.count("log line dropped: 4 MiB of them wait for the disk");
+    case Put::noThread:
+      return _counters.count("log line dropped: there is no thread to write it");
+  }
+}
+
+bool MessageLogFile::append(const std::string& line) {
+  const double now = platform::timevalToSeconds(_clock.now());
+  if (!currentFileIsOpen(now) && !openCurrentFile()) return false;
   if (!_current.append(line)) {
     remove({_current.path(), _current.created()});
     _current.close();
-    return;
+    return false;
   }
   logInfo("writeToLogFile: Saved log message to %s", _current.path().c_str());
+  return true;
 }
 
 bool MessageLogFile::currentFileIsOpen(double now) const {

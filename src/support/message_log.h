@@ -1,19 +1,21 @@
 // The diagnostic message log: a readable record of what the backends sent, one current file. Any thread.
 #pragma once
 
+#include <cstddef>
 #include <initializer_list>
 #include <optional>
 #include <string>
 #include <string_view>
 
-#include "base/mutex.h"
+#include "platform/disk_writer.h"
 #include "support/open_log_file.h"
 
 namespace veltrad {
 
 namespace platform {
 class Clock;
-}
+class Counters;
+}  // namespace platform
 
 class MessageLog {
  public:
@@ -24,11 +26,15 @@ class MessageLog {
 
 // In a directory of its own, files "veltrad_SECONDS_messageLog.diag", one of them current and at most a day
 // old. The directory is the only state: the current file is held open only while no name came to the
-// directory or went from it. The lock covers the whole operation.
+// directory or went from it. Nobody waits for the disk: lines are stamped and queued, and the disk writer's
+// thread does the rest; a line that is not written is counted.
 class MessageLogFile final : public MessageLog {
  public:
-  // The clock outlives it. The directory is made by the first message.
-  MessageLogFile(const platform::Clock& clock, std::string directory);
+  static constexpr std::size_t kMostBytes = 4u << 20;  // of lines that wait; a single one may be longer
+
+  // What it takes outlives it. The directory is made by the first message.
+  MessageLogFile(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer,
+                 platform::Counters& counters);
   void writeToLogFile(std::string_view format, std::initializer_list<std::string_view> values) override;
 
  private:
@@ -36,18 +42,22 @@ class MessageLogFile final : public MessageLog {
     std::string path;
     std::optional<double> created;  // seconds since 1970
   };
-  bool currentFileIsOpen(double now) const REQUIRES(_mutex);
-  bool openCurrentFile() REQUIRES(_mutex);
-  std::optional<LogFile> newestSurvivor() REQUIRES(_mutex);
-  std::optional<LogFile> createFile() REQUIRES(_mutex);
-  void remove(const LogFile& file) REQUIRES(_mutex);
+  bool append(const std::string& line);
+  bool currentFileIsOpen(double now) const;
+  bool openCurrentFile();
+  std::optional<LogFile> newestSurvivor();
+  std::optional<LogFile> createFile();
+  void remove(const LogFile& file);
 
   // Constant after construction.
   const platform::Clock& _clock;
   const std::string _directory;
+  platform::Counters& _counters;
 
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  OpenLogFile _current GUARDED_BY(_mutex);
+  // The writer's thread only.
+  OpenLogFile _current;
+
+  platform::DiskWriter::Queue _queue;  // last: its end is the end of the writer's work here
 };
 
 // "%@" by "%@". Exposed for its table of tests.

@@ -1,4 +1,4 @@
-// The process's own services: sandbox, service manager, counters.
+// The process's own services: sandbox, service manager.
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -10,12 +10,9 @@
 #include <cerrno>
 #include <thread>
 
-#include "base/json.h"
-#include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
 #include "fakes/unix_socket.h"
 #include "platform/child_process.h"
-#include "platform/counters.h"
 #include "platform/landlock.h"
 #include "platform/sandbox.h"
 #include "platform/service_manager.h"
@@ -112,27 +109,6 @@ TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
     });
     EXPECT_EQ(child.said, c.verdict);
   }
-}
-
-TEST(Counters, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
-  RecordedLog log;
-  FakeFileStore files;
-  Counters counters;
-  counters.count("message dropped: the queue is full", 42);
-  counters.count("nothing", 0);
-  files.failWrites(FileFailure::Kind::noSpace);
-  log.expectLine(LogLevel::error, "The counters could not be written: /run/c: No space left on device");
-  counters.writeIfChanged(files, "/run/c", 5);
-  counters.writeIfChanged(files, "/run/c", 5);
-  files.failWrites({});
-  counters.writeIfChanged(files, "/run/c", 1'700'000'000.5);
-  counters.writeIfChanged(files, "/run/c", 1'700'000'000.5);
-  EXPECT_EQ(files.replaced(), 1);
-  EXPECT_EQ(files.mode("/run/c"), 0644u);
-  const Dictionary expected{{"pid", static_cast<int>(::getpid())},
-                            {"started", 1'700'000'000.5},
-                            {"counts", Dictionary{{"message dropped: the queue is full", 42}}}};
-  EXPECT_EQ(parseJSON(files.bytes("/run/c").value_or("")).value(), Value(expected));
 }
 
 }  // namespace

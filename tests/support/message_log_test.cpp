@@ -14,6 +14,8 @@
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 #include "fakes/temporary_directory.h"
+#include "platform/counters.h"
+#include "platform/disk_writer.h"
 
 namespace veltrad {
 namespace {
@@ -27,14 +29,19 @@ class MessageLogTest : public ::testing::Test {
     return std::string("veltrad_") + zeros + std::to_string(seconds) + "_messageLog.diag";
   }
   std::string dateAt(std::int64_t seconds) const { return "(" + dateDescription(double(seconds)) + ") "; }
-  void write(const std::string& text = "text %@ 5%") { _messages.writeToLogFile("[%@ -> %@", {"b", text}); }
+  void write(const std::string& text = "text %@ 5%") {
+    _messages.writeToLogFile("[%@ -> %@", {"b", text});
+    EXPECT_TRUE(_writer.drain(std::chrono::steady_clock::now() + std::chrono::seconds(10)));
+  }
 
   const std::int64_t _now = ::time(nullptr);
   const std::string _line = dateAt(_now) + "[b -> text %@ 5%\n";
   RecordedLog _log;
   TemporaryDirectory _place;
   FakeClock _clock{{_now, 900'000}};
-  MessageLogFile _messages{_clock, _place.path()};
+  platform::Counters _counters;
+  platform::DiskWriter _writer;
+  MessageLogFile _messages{_clock, _place.path(), _writer, _counters};
   const std::string _current = _place.path(nameAt(_now));
 };
 
@@ -101,6 +108,7 @@ TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) 
   rlimit before{};
   ::getrlimit(RLIMIT_FSIZE, &before);
   const auto handler = ::signal(SIGXFSZ, SIG_IGN);
+  std::uint64_t lost = 0;
   const std::function<void()> inItsPlace[] = {
       [&] { std::filesystem::create_symlink("elsewhere", _current); },
       [&] { ASSERT_EQ(::mkfifo(_current.c_str(), 0600), 0); },
@@ -113,6 +121,7 @@ TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) 
   for (const auto& put : inItsPlace) {
     put();
     write("lost");
+    EXPECT_EQ(_counters.value("log line lost: the disk did not take it"), ++lost);
     ::setrlimit(RLIMIT_FSIZE, &before);
     ASSERT_THAT(_place.names(), ElementsAre("elsewhere"));
     _log.expectLine(Level::info, "writeToLogFile: Deleted expired veltrad log file " + _current + " (20");
@@ -133,6 +142,22 @@ TEST_F(MessageLogTest, AClockThatJumpsLeavesOneFile) {
     EXPECT_THAT(_place.names(), ElementsAre(nameAt(later)));
   }
   EXPECT_EQ(_place.read(nameAt(later)), dateAt(later) + "[b -> text %@ 5%\n" + _line);
+}
+
+TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
+  platform::DiskWriter::Queue other(_writer, 1);
+  std::latch stalled(1);
+  other.put([&] { stalled.wait(); }, 1);
+  const std::string megabyte(1 << 20, 'x');
+  for (int i = 0; i < 6; ++i) _messages.writeToLogFile("%@", {megabyte});
+  EXPECT_EQ(_counters.value("log line dropped: 4 MiB of them wait for the disk"), 3u);
+  const std::string stamp = dateAt(_now);
+  _clock.advance(60);  // a line has the time at which it was logged
+  stalled.count_down();
+  write("after");
+  const std::string text = _place.read(_place.names().at(0));
+  EXPECT_EQ(text.substr(0, stamp.size() + 1), stamp + "x");
+  EXPECT_EQ(text.size(), 3 * (stamp.size() + megabyte.size() + 1) + (dateAt(0) + "[b -> after\n").size());
 }
 
 TEST_F(MessageLogTest, ManyThreadsMakeOneFileOfWholeLines) {

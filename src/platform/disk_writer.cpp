@@ -1,0 +1,116 @@
+// Jobs in, one after the other out.
+#include "platform/disk_writer.h"
+
+#include <algorithm>
+#include <new>
+#include <system_error>
+
+#include "platform/log.h"
+
+namespace veltrad::platform {
+
+DiskWriter::Queue::Queue(DiskWriter& writer, std::size_t most) : _writer(writer), _lane(writer.open(most)) {}
+
+DiskWriter::Queue::~Queue() {
+  _writer.close(_lane);
+}
+
+DiskWriter::Lanes::iterator DiskWriter::open(std::size_t most) {
+  const Lock held(_mutex);
+  return _lanes.insert(_lanes.end(), Lane{most, {}});
+}
+
+void DiskWriter::close(Lanes::iterator lane) {
+  Lanes closed;  // its jobs are let go after the lock
+  const Lock held(_mutex);
+  while (lane->runs) _done.wait(_mutex);
+  closed.splice(closed.end(), _lanes, lane);
+}
+
+DiskWriter::Queue::Put DiskWriter::put(Lanes::iterator lane, Job job, std::size_t bytes) {
+  const Lock held(_mutex);
+  if (lane->bytes > 0 && (bytes > lane->most || lane->bytes > lane->most - bytes)) return Queue::Put::full;
+  if (!startThread()) return Queue::Put::noThread;
+  try {
+    lane->waiting.push_back({std::move(job), bytes});
+  } catch (const std::bad_alloc&) {
+    return Queue::Put::full;
+  }
+  lane->bytes += bytes;
+  _news.notifyOne();
+  return Queue::Put::taken;
+}
+
+DiskWriter::~DiskWriter() {
+  std::thread thread;
+  {
+    const Lock held(_mutex);
+    _ends = true;
+    _news.notifyOne();
+    thread.swap(_thread);
+  }
+  if (thread.joinable()) thread.join();
+}
+
+bool DiskWriter::startThread() {
+  if (_thread.joinable()) return true;
+  try {
+    _thread = std::thread([this] { run(); });
+  } catch (const std::system_error&) {
+    return false;
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
+  return true;
+}
+
+DiskWriter::Lane* DiskWriter::takeTurn() {
+  const auto lane =
+      std::find_if(_lanes.begin(), _lanes.end(), [](const Lane& one) { return !one.waiting.empty(); });
+  if (lane == _lanes.end()) return nullptr;
+  _lanes.splice(_lanes.end(), _lanes, lane);
+  return &*lane;
+}
+
+void DiskWriter::run() {
+  Lane* lane = nullptr;
+  Waiting next;
+  for (;;) {
+    {
+      const Lock held(_mutex);
+      if (lane) {
+        lane->bytes -= next.bytes;
+        lane->runs = false;
+        _done.notifyAll();
+      }
+      while (!(lane = takeTurn())) {
+        if (_ends) return;
+        _news.wait(_mutex);
+      }
+      lane->runs = true;
+      next = std::move(lane->waiting.front());
+      lane->waiting.pop_front();
+    }
+    try {
+      next.job();
+    } catch (const std::bad_alloc&) {
+      logError("DiskWriter(run): no memory to write with");
+    }
+    next.job = nullptr;
+  }
+}
+
+bool DiskWriter::busy() const {
+  return std::any_of(_lanes.begin(), _lanes.end(),
+                     [](const Lane& lane) { return lane.runs || !lane.waiting.empty(); });
+}
+
+bool DiskWriter::drain(std::chrono::steady_clock::time_point deadline) {
+  const Lock held(_mutex);
+  while (busy()) {
+    if (!_done.waitUntil(_mutex, deadline)) return !busy();
+  }
+  return true;
+}
+
+}  // namespace veltrad::platform

@@ -1,0 +1,112 @@
+// The thread that waits for the disk, so that nobody else does.
+#include "platform/disk_writer.h"
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <latch>
+#include <string>
+
+#include "base/json.h"
+#include "fakes/fake_file_store.h"
+#include "fakes/recorded_log.h"
+#include "platform/child_process.h"
+#include "platform/counters.h"
+#include "platform/counters_file.h"
+
+namespace veltrad::platform {
+namespace {
+
+using Put = DiskWriter::Queue::Put;
+using Clock = std::chrono::steady_clock;
+
+Clock::time_point soon() {
+  return Clock::now() + std::chrono::seconds(10);
+}
+
+TEST(DiskWriter, AStalledJobHoldsUpNobodyAndEachQueueHasItsOwnBound) {
+  std::latch stalled(1);
+  std::string order;
+  DiskWriter writer;
+  DiskWriter::Queue a(writer, 10), b(writer, 10);
+  const auto put = [&](DiskWriter::Queue& queue, char name, std::size_t bytes) {
+    return queue.put([&order, name] { order += name; }, bytes);
+  };
+  EXPECT_EQ(a.put([&] { stalled.wait(); }, 11), Put::taken);  // larger than the bound, but alone
+  EXPECT_EQ(put(a, '-', 1), Put::full);
+  EXPECT_EQ(put(b, '1', 4), Put::taken);
+  EXPECT_EQ(put(b, '2', 6), Put::taken);
+  EXPECT_EQ(put(b, '-', 1), Put::full);
+  EXPECT_FALSE(writer.drain(Clock::now()));
+  stalled.count_down();
+  EXPECT_TRUE(writer.drain(soon()));
+  EXPECT_EQ(order, "12");
+
+  std::latch begun(1), again(1);
+  EXPECT_EQ(a.put([&] { begun.count_down(), again.wait(); }, 1), Put::taken);
+  begun.wait();
+  for (const char name : {'3', '4', '5'}) put(a, name, 1);
+  for (const char name : {'6', '7'}) put(b, name, 1);
+  again.count_down();
+  EXPECT_TRUE(writer.drain(soon()));
+  EXPECT_EQ(order, "1263745");  // in turn
+}
+
+TEST(DiskWriter, AThreadThatCannotBeStartedIsStartedByALaterJob) {
+  const ChildProcess child([](const auto& say) {
+    if (::getuid() == 0 && ::setuid(65534) != 0) return say("no other user");
+    rlimit limit{};
+    ::getrlimit(RLIMIT_NPROC, &limit);
+    const rlimit none{0, limit.rlim_max};
+    DiskWriter writer;
+    DiskWriter::Queue queue(writer, 10);
+    ::setrlimit(RLIMIT_NPROC, &none);
+    say(queue.put([&] { say("never"); }, 1) == Put::noThread ? "no thread" : "a thread");
+    ::setrlimit(RLIMIT_NPROC, &limit);
+    queue.put([&] { say("written"); }, 1);
+    writer.drain(soon());
+  });
+  EXPECT_EQ(child.said, "no thread\nwritten\n");
+}
+
+TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
+  RecordedLog log;
+  FakeFileStore files;
+  Counters counters;
+  DiskWriter writer;
+  CountersFile file(counters, files, writer, "/run/c", 1'700'000'000.5);
+  const auto written = [&] {
+    EXPECT_TRUE(file.writeSoon());
+    EXPECT_TRUE(writer.drain(soon()));
+    return files.replaced();
+  };
+  counters.count("message dropped: the queue is full", 42);
+  counters.count("nothing", 0);
+  files.failWrites(FileFailure::Kind::noSpace);
+  log.expectLine(LogLevel::error, "The counters could not be written: /run/c: No space left on device");
+  EXPECT_EQ(written() + written(), 0);
+  files.failWrites({});
+  EXPECT_EQ(written(), 1);
+  EXPECT_EQ(written(), 1);
+  EXPECT_EQ(files.mode("/run/c"), 0644u);
+
+  // While the disk is stalled one write waits, and it writes what has been counted until it runs.
+  std::latch begun(1), stalled(1);
+  DiskWriter::Queue other(writer, 1);
+  other.put([&] { begun.count_down(), stalled.wait(), counters.count("last"); }, 1);
+  begun.wait();
+  for (int i = 0; i < 3; ++i) counters.count("first"), file.writeSoon();
+  EXPECT_FALSE(file.writeLast(Clock::now()));
+  stalled.count_down();
+  EXPECT_TRUE(file.writeLast(soon()));
+  EXPECT_EQ(files.replaced(), 2);
+  const Dictionary expected{
+      {"pid", static_cast<int>(::getpid())},
+      {"started", 1'700'000'000.5},
+      {"counts", Dictionary{{"first", 3}, {"last", 1}, {"message dropped: the queue is full", 42}}}};
+  EXPECT_EQ(parseJSON(files.bytes("/run/c").value_or("")).value(), Value(expected));
+}
+
+}  // namespace
+}  // namespace veltrad::platform
