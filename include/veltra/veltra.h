@@ -206,11 +206,12 @@ VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply
 /* Uploads a regular file of at most 2,147,483,647 bytes. The library opens it, without waiting for it and
  * without following a link, and lends it to the daemon, which has no other way to it; it is named by the last
  * component of `path`. Of a file that others serve (FUSE, a network) it lends a copy, which it makes before
- * the call goes, however long that takes. The answer comes when the servers have answered. veltra_reply_uploaded: a request was
- * carried out. Where the server has confirmed it, the library removes the file, if its path still names the
- * same one (veltra_reply_removed): it renames it to a hidden name beside it first, so that no other file is
- * removed that somebody puts there. A file that has changed meanwhile stays. The answer's error is the
- * library's: why nobody takes such a file, or why one that was stored could not be removed. */
+ * the call goes, however long that takes. The answer comes when the servers have answered.
+ * veltra_reply_uploaded: a request was carried out. Where the server has confirmed it, the library removes
+ * the file, if its path still names the same one (veltra_reply_removed): it renames it to a hidden name
+ * beside it first, so that no other file is removed that somebody puts there. A file that has changed
+ * meanwhile stays. The answer's error is the library's: why nobody takes such a file, or why one that was
+ * stored could not be removed. */
 VELTRA_API veltra_status veltra_session_upload_file(veltra_session*, const char* path, veltra_callback,
                                                     void* context);
 VELTRA_API veltra_status veltra_session_upload_file_wait(veltra_session*, const char* path,
