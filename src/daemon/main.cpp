@@ -160,6 +160,7 @@ int main(int count, char** arguments) {
   if (!socket) return 1;
   removeUnfinishedFiles(services.root);
 
+  services.writer.start();  // so that later no thread comes or goes but for clients
   platform::CountersFile countersFile(services.counters, services.files, services.writer,
                                       services.root.countersPath(), started);
   Daemon daemon(services);

@@ -52,6 +52,11 @@ DiskWriter::~DiskWriter() {
   if (thread.joinable()) thread.join();
 }
 
+bool DiskWriter::start() {
+  const Lock held(_mutex);
+  return startThread();
+}
+
 bool DiskWriter::startThread() {
   if (_thread.joinable()) return true;
   try {

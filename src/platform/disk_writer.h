@@ -13,7 +13,7 @@
 
 namespace veltrad::platform {
 
-// The thread starts with the first job. Jobs of one queue run in order, queues take turns, so that a long one
+// The thread starts with start(), or where none could be had then, with the first job. Jobs of one queue run in order, queues take turns, so that a long one
 // holds up another by one job at a time. Its lock is a leaf, and no job runs under it.
 class DiskWriter {
  public:
@@ -59,6 +59,8 @@ class DiskWriter {
   DiskWriter(const DiskWriter&) = delete;
   DiskWriter& operator=(const DiskWriter&) = delete;
 
+  // False: no thread could be had; the first job tries again.
+  bool start();
   // Waits until everything is written, at most until `deadline`; false: not everything is.
   bool drain(std::chrono::steady_clock::time_point deadline);
 

@@ -38,6 +38,8 @@ class Hostile(SystemTest):
 
     def test_broken_random_and_half_frames(self):
         descriptors = lambda: len(os.listdir(f"/proc/{self.process.popen.pid}/fd"))
+        self.unharmed()
+        self.process.wait_for_line("Saved log message")  # the log stays open
         before, rng = descriptors(), random.Random(42)
         good = plistlib.dumps({"op": SEND, "args": {"category": 1, "type": 2, "payload": {"a": [1, 2.5, b"x", "y"]}}},
                               fmt=plistlib.FMT_BINARY)
