@@ -258,6 +258,7 @@ class Daemon(Process):
         return took
 
 
+START = "startConfigWithCompletionHandler:"
 IDENTITY = ("--client", "phone", "--service", "ringer", "--require-user-info")
 
 
@@ -379,6 +380,14 @@ class SystemTest(unittest.TestCase):
         daemon = Daemon(self.root, **options)
         self.addCleanup(daemon.kill)
         return daemon
+
+    def started(self, client_type=7):
+        """A session at the bare socket that has been started."""
+        wire = Wire(self.root)
+        self.addCleanup(wire.close)
+        wire.describe(client_type)
+        wire.call(START)
+        return wire
 
     @contextlib.contextmanager
     def serving(self, *allowed, **options):

@@ -58,17 +58,6 @@ class Dashboard(HTTPSTest):
                 self.assertLess(time - times[0], tick * PERIOD / 1000 + 2)
             self.assertLessEqual(len(times), 5)
 
-    def test_a_datagram_that_nobody_acknowledges_is_given_up(self):
-        self.report_to(reliable=20)
-        self.lab.control(path="/dashboard", ack="drop")
-        with self.serving():
-            client = self.client()
-            client.message(number=1)
-            wait_until(lambda: self.stats().get("datagram given up: never acknowledged", 0) >= 2, "given up")
-            self.assertEqual(len(self.dashboard(5, method=5)), 5)
-            self.lab.reset()
-            client.close()
-
     # What the dashboard does to one acknowledgement, how often that event then arrives, what is counted.
     WRONG = [({"ack": "duplicate"}, 1, "no such datagram waits"), ({"ack": "short"}, 2, "shorter than 62 bytes"),
              ({"ack": "long"}, 1, None), ({"ack": "foreign"}, 2, "no such datagram waits"),

@@ -30,7 +30,9 @@ class Posts(HTTPSTest):
                 client.message()
                 self.lab.control(path="/events", status=status)
                 self.assertEqual(client.flush()[1], code)
-                self.assertEqual(client.states(clientName="phone", serviceName="phone"), ["httppost"] * (code is None))
+                # Only a changed identity has the states computed anew.
+                for service, reports in (("phone", code is None), ("bell", True), ("phone", True)):
+                    self.assertEqual(client.states(clientName="phone", serviceName=service), ["httppost"] * reports)
             self.lab.reset()
             client.close()
 

@@ -48,27 +48,6 @@ class Road(SystemTest):
         logs = list((self.root.path / "var/mobile/Library/Logs/Zentrel/Retired").iterdir())
         self.assertEqual(sum(log.read_text().count("[httppost -> sendMessageWithDictionary]") for log in logs), 3)
 
-    def test_batch_realtime_and_server_error(self):
-        with self.serving():
-            session, _ = self.open(7, "--batch-events")
-            for number in range(3):
-                session.send(number=number)
-            self.assertEqual(self.lab.received("events"), [])
-            self.assertEqual(len(json.loads(session.ask("flush")["reply"])["events"]), 4)
-            session.ask("send", category=6, type=2, flag=1, payload={"urgent": True})
-            batch, urgent = sorted(self.lab.received("events", 2), key=lambda post: post["path"])
-            self.assertEqual([e.get("number") for e in batch["body"]["events"]], [None, 0, 1, 2])
-            self.assertTrue(batch["compressed"])
-            self.assertEqual((urgent["path"], urgent["headers"]["X-VLT-Event-Map"]), ("/realtime", "6 2"))
-            self.lab.control(path="/events", status=503, times=1)
-            session.send()
-            self.assertEqual(session.ask("flush")["error"]["description"],
-                             "backend httppost disabled by server 503 return code")
-            # Only a changed identity has the states computed anew.
-            for service, backends in (("ringer", []), ("bell", ["httppost"])):
-                states = session.ask("states", userInfo={"clientName": "phone", "serviceName": service})
-                self.assertEqual(states["backends"], backends)
-
     def test_examples(self):
         """The clients in C and in Python do what they say."""
         with self.serving("user info provided without requiring it"):

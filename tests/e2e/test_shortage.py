@@ -69,24 +69,6 @@ class Shortage(SystemTest):
             self.assertEqual(event["_build"], DEVICE["BuildVersion"])
             client.close()
 
-    def test_a_shortage_changes_no_identifier(self):
-        """The file is there all the time; a session that starts during the shortage gets what it says, or nothing."""
-        with self.serving("the device's identifiers") as daemon:
-            client, other = Wire(self.root), Wire(self.root)
-            for wire in (client, other):
-                wire.describe()
-            client.call("startConfigWithCompletionHandler:")
-            before, = self.lab.received("events", 1)
-            self.limit(daemon, 0)
-            self.assertEqual(other.call("startConfigWithCompletionHandler:")["results"].get("backends"), ["httppost"])
-            self.limit(daemon)
-            other.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"during": True})
-            self.lab.wait_for_events(1, during=True)
-            self.assertEqual({post["body"]["clientId"] for post in self.lab.received("events")},
-                             {before["body"]["clientId"]})
-            client.close()
-            other.close()
-
     def test_entitlements_during_a_shortage(self):
         """However far a connection gets, the next one finds the rules as they are."""
         with self.serving("A connection could not be accepted", "Entitlements could not be read just now") as daemon:
