@@ -62,8 +62,13 @@ class Posts(HTTPSTest):
     def test_internal_builds_of_three_types_report_the_number(self):
         self.root.write("etc/veltrad/device.plist", {**DEVICE, "ReleaseType": "Internal"})
         for name in ("quindle", "crovish", "yarrowin"):
-            self.serve(entry(), name=name)
+            self.serve(entry(), entry("extras", extras_on_internal=1, custom_clientId=1), name=name)
         with self.serving():
+            for name, identifier in (("phone", None), ("extras", DEVICE["UniqueDeviceID"])):
+                self.client(name).close()
+                post, *_ = self.posts(name, 2)
+                self.assertEqual(post["headers"]["X-VLT-Internal-Build"], "1")
+                self.assertEqual(post["body"]["clientId"], identifier or self.preferences()["uuidRespectDNU"])
             for client_type, number in ((7, True), (11, True), (13, True), (12, False), (17, False)):
                 client = self.client(client_type=client_type)
                 self.assertEqual(client.event()["_sessionID"] == client.number, number, client_type)

@@ -3,7 +3,7 @@ import json
 import subprocess
 import time
 
-from harness import IDENTITY, SOURCE, SystemTest, Wire, program, wait_until
+from harness import IDENTITY, SOURCE, SystemTest, program, wait_until
 
 
 class Road(SystemTest):
@@ -36,11 +36,9 @@ class Road(SystemTest):
         self.assertEqual(set(post["body"]), {"postTime", "clientId", "events"})
         self.assertAlmostEqual(post["body"]["postTime"], time.time(), delta=120)
         self.assertRegex(post["body"]["clientId"], "^[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}$")
-        headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer",
-                   "User-Agent": "Veltra/8.2 (Elm4,2; 12.1)",
-                   "X-VLT-Client-Version": "3", "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2",
-                   "Accept": "application/json", "Content-Type": "application/json",
-                   "Content-Length": str(post["bytes"])}
+        headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer", "X-VLT-Client-Version": "3",
+                   "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2", "User-Agent": "Veltra/8.2 (Elm4,2; 12.1)",
+                   "Accept": "application/json", "Content-Type": "application/json", "Content-Length": str(post["bytes"])}
         self.assertEqual({key: post["headers"].get(key) for key in headers}, headers)
         self.assertNotIn("X-VLT-Internal-Build", post["headers"])
         self.assertEqual((post["method"], post["path"]), ("POST", "/events"))
@@ -70,17 +68,15 @@ class Ctl(SystemTest):
             daemon.wait_for_line("sendMessageWithDictionary: Missing mandatory parameter 'type'")
             self.lab.wait_for_events(1, _method=0, _status=2)
         answers = [json.loads(line) for line in out.splitlines()]
-        self.assertEqual([a["op"] for a in answers], ["start", "displayURL", "error", "error", "send", "send", "sleep",
-                                                      "flush", "restart", "states", "finish"])
-        start, url, bad, unknown, send, send2, _, flush, restart, states, _ = answers
-        self.assertEqual(url["reply"], "https://display.example/phone")
-        self.assertEqual((bad["line"], unknown["line"]), (3, 4))
-        self.assertIn("dance", unknown["description"])
-        self.assertEqual((send["reply"], send2["reply"]), (None, None))
-        self.assertEqual(flush, {"op": "flush", "reply": None, "error": {
-            "domain": "com.florn.veltra.error", "code": -1, "description": "Nothing to flush"}})
-        for answer in (start, restart, states):
-            self.assertEqual(answer["backends"], ["httppost"])
+        self.assertIn("dance", answers[3].pop("description"))
+        self.assertIn("events", json.loads(answers[10].pop("reply")))
+        answers[2].pop("description")
+        self.assertEqual(answers, [
+            {"op": "start", "backends": ["httppost"]}, {"op": "displayURL", "reply": "https://display.example/phone"},
+            {"op": "error", "line": 3}, {"op": "error", "line": 4}, {"op": "send", "reply": None},
+            {"op": "send", "reply": None}, {"op": "sleep"}, {"op": "flush", "reply": None, "error": {
+                "domain": "com.florn.veltra.error", "code": -1, "description": "Nothing to flush"}},
+            {"op": "restart", "backends": ["httppost"]}, {"op": "states", "backends": ["httppost"]}, {"op": "finish"}])
 
     def test_copies_between_answers(self):
         lines = [json.dumps({"op": "send", "category": 5, "type": 2, "payload": {"number": n, "text": "a\nb"}})
@@ -140,9 +136,7 @@ class Ctl(SystemTest):
             reason = "message dropped: the session has no back ends"
 
             path = self.root.path / "run/veltrad/counters.json"
-            wait_until(path.exists, "the first counters")
-            wait_until(lambda: json.loads(path.read_text())["counts"].get(reason) == 1, "a counted drop")
-            self.assertIn(reason, self.ctl("stats")[0])
+            wait_until(lambda: path.exists() and reason in self.ctl("stats")[0], "a counted drop")
             self.assertEqual(json.loads(self.ctl("stats", "--json")[0])["counts"][reason], 1)
         # The session's own stop message is not missed.
         self.assertEqual(json.loads(path.read_text())["counts"][reason], 1)

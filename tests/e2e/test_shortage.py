@@ -82,15 +82,12 @@ class Shortage(SystemTest):
                     self.assertIsNone(self.refusal())
 
     def test_a_stop_ends_only_its_own_socket(self):
-        for name, put in (("a file", lambda path: open(path, "w").close()), ("a link", lambda path: os.symlink("x", path)),
-                          ("nothing", lambda path: None)):
-            with self.subTest(name):
-                with self.serving():
-                    os.unlink(self.root.socket)
-                    put(self.root.socket)
-                self.assertEqual(os.path.lexists(self.root.socket), name != "nothing")
-                if name != "nothing":
-                    os.unlink(self.root.socket)
+        for put in (lambda path: open(path, "w").close(), lambda path: os.symlink("x", path)):
+            with self.serving():
+                os.unlink(self.root.socket)
+                put(self.root.socket)
+            self.assertTrue(os.path.lexists(self.root.socket))
+            os.unlink(self.root.socket)
 
 
 class Start(SystemTest):

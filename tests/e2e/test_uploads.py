@@ -91,7 +91,6 @@ class Uploads(SystemTest):
         real = self.make("real")
         kinds = {
             "missing": (lambda path: None, "cannot be opened: No such file", REGULAR),
-            "none/x": (lambda path: None, "cannot be opened: No such file", REGULAR),
             "directory": (os.mkdir, "is a directory", REGULAR),
             "directory/": (lambda path: None, "cannot be opened", REGULAR),
             "link": (lambda path: os.symlink(real, path), "is a symbolic link", REGULAR),
@@ -115,7 +114,7 @@ class Uploads(SystemTest):
                     daemon.wait_for_line(line, seen.count(line))
             daemon.wait_for_line("File upload failed for", len(kinds))
         self.assertEqual(self.fates(),
-                         {"file refused: nothing lent, or no regular file": 8, "file refused: too large": 1,
+                         {"file refused: nothing lent, or no regular file": 7, "file refused: too large": 1,
                           "file refused: empty or unreadable": 1})
         self.assertTrue(os.path.exists(real))
         self.assertEqual(self.lab.received("uploads"), [])
@@ -194,8 +193,6 @@ class Uploads(SystemTest):
             "gone": (os.unlink, None, "cannot be found any more: No such file"),
         }
         with self.serving(CHANGED) as daemon:
-            session, _ = self.open()
-            before = self.descriptors(session)
             for count, (name, (change, line, problem)) in enumerate(changes.items(), 1):
                 with self.subTest(name):
                     path = os.fsdecode(self.make(name))
@@ -211,11 +208,6 @@ class Uploads(SystemTest):
                     self.assertEqual(os.path.lexists(path), name != "gone")
                     if line:
                         daemon.wait_for_line(f"File {path} {line}")
-            self.assertEqual(session.ask("uploadFile", path=os.fsdecode(self.make("last"))), {"op": "uploadFile",
-                                                                                              "uploaded": True})
-            self.assertFalse((self.files / "last").exists())
-            self.assertEqual(self.descriptors(session), before)
-            self.assertEqual(session.close(), 0)
 
     def test_a_stop_waits_for_no_upload(self):
         with self.serving("The daemon is stopping", "File upload failed") as daemon:
@@ -267,6 +259,7 @@ class Uploads(SystemTest):
         removed = 0
         with self.serving(CHANGED):
             session, _ = self.open()
+            before = self.descriptors(session)
             for number in range(150):
                 held = {}
                 for place in (path, spare):
@@ -281,19 +274,12 @@ class Uploads(SystemTest):
                     removed += gone
                     self.assertTrue(digest == uploaded or not gone, f"round {number}: the other file is gone")
                     os.close(descriptor)
-                wait_until(self.clear, "an empty directory")
+                while left := list(self.files.iterdir()):  # the swapper moves them meanwhile
+                    left[0].unlink(missing_ok=True)
+            self.assertEqual(self.descriptors(session), before)
         swapper.kill()
         swapper.wait()
         self.assertGreater(removed, 0)
-
-    def clear(self):
-        """Whether all files are removed, which the swapper may move meanwhile."""
-        for left in os.listdir(self.files):
-            try:
-                os.unlink(self.files / left)
-            except FileNotFoundError:
-                pass
-        return not os.listdir(self.files)
 
     @unittest.skipUnless(os.getuid() == 0 and os.path.exists("/dev/fuse"), "needs the right to mount")
     def test_files_that_others_serve(self):

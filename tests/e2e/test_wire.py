@@ -52,6 +52,7 @@ class Hostile(SystemTest):
                 for _ in range(rng.randrange(1, 6)):
                     data[rng.randrange(12, len(data))] = rng.randrange(256)
             else:
+                data[5] = 1
                 data, passed = data[:rng.randrange(1, len(data))], [client.socket.fileno()]  # holds its own end
             try:
                 client.raw(bytes(data), passed)
