@@ -132,7 +132,7 @@ class DaemonConnection {
   ipc::FrameReader _frames;
   std::vector<Arrived> _arrived;
 
-  Mutex _lock{LockRank::leaf};
+  Mutex _lock LEAF_LOCK{LockRank::leaf};
   Reader _reader GUARDED_BY(_lock) = Reader::ownThread;  // which first takes what came behind the hello
   std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
   OutFrames _out GUARDED_BY(_lock);

@@ -107,7 +107,7 @@ class Listener {
   // The owner's.
   ipc::Thread _acceptThread;
 
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   bool _stopping GUARDED_BY(_mutex) = false;
   std::map<std::uint64_t, Client> _clients GUARDED_BY(_mutex);

@@ -86,7 +86,7 @@ class OutQueue {
   // Written under the lock; a hint for the connection's thread, which is woken after it rose from zero.
   std::atomic<std::size_t> _waitingBytes{0};
 
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   platform::FileDescriptor _socket GUARDED_BY(_mutex);
   platform::FileDescriptor _wakeUp GUARDED_BY(_mutex);
   bool _gone GUARDED_BY(_mutex) = false;

@@ -43,7 +43,7 @@ class MachineProperties final : public DeviceProperties {
 
   FileStore& _files;
   const std::string _path;
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   // As last read; what stands in during a shortage.
   std::optional<Dictionary> _lastList GUARDED_BY(_mutex);
   std::map<std::string, std::optional<std::string>, std::less<>> _lastFacts GUARDED_BY(_mutex);

@@ -34,7 +34,7 @@ class Entitlements {
 
   FileStore& _files;
   const std::string _path;
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
   bool _read GUARDED_BY(_mutex) = false;
   Array _rules GUARDED_BY(_mutex);

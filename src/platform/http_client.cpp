@@ -31,7 +31,7 @@ class Answer {
   }
 
  private:
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _given;
   std::optional<HTTPResult> _result GUARDED_BY(_mutex);
 };

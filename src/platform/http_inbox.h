@@ -52,7 +52,7 @@ class HTTPInbox {
   void completed();
 
  private:
-  mutable Mutex _mutex{LockRank::leaf};
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   Transfers _arrived GUARDED_BY(_mutex);
   std::size_t _underWay GUARDED_BY(_mutex) = 0;  // all lanes, completions that still run included

@@ -44,7 +44,7 @@ struct Target {
 // A line may be written under any other lock, the leaves included: this one is held for two copies and takes
 // nothing.
 struct State {
-  Mutex mutex{static_cast<LockRank>(static_cast<int>(LockRank::leaf) + 1)};
+  Mutex mutex LEAF_LOCK{static_cast<LockRank>(static_cast<int>(LockRank::leaf) + 1)};
   std::shared_ptr<const Target> target GUARDED_BY(mutex) = std::make_shared<const Target>();
   std::shared_ptr<const Sink> sink GUARDED_BY(mutex);
 };

@@ -64,7 +64,7 @@ class FilePreferences final : public Preferences {
 
   FileStore& _files;
   const std::string _directory;
-  Mutex _mutex{LockRank::leaf};  // around read, change, rename
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // around read, change, rename
   struct Content {
     FileStamp stamp;
     Dictionary all;

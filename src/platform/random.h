@@ -17,7 +17,7 @@ class UnseededSequence final : public Random {
   double uniform() override;
 
  private:
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   unsigned short _state[3] GUARDED_BY(_mutex) = {0, 0, 0};
 };
 

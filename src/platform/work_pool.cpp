@@ -40,7 +40,7 @@ struct WorkPool::Impl {
     ended.notifyAll();
   }
 
-  Mutex mutex{LockRank::leaf};
+  Mutex mutex LEAF_LOCK{LockRank::leaf};
   Condition ended;
   std::unique_ptr<asio::io_context> context GUARDED_BY(mutex);
   std::optional<asio::executor_work_guard<asio::io_context::executor_type>> guard GUARDED_BY(mutex);

@@ -68,7 +68,7 @@ class ClientSession {
   // Own thread only.
   veltra_session* _session = nullptr;
   // Guarded by _mutex.
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<Answer> _answer GUARDED_BY(_mutex);
 };
 

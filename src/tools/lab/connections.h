@@ -26,7 +26,7 @@ class Connections {
   void add(int socket);
   void remove(int socket);
 
-  Mutex _mutex{LockRank::leaf};
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::set<int> _sockets GUARDED_BY(_mutex);
   bool _stopped GUARDED_BY(_mutex) = false;
 };

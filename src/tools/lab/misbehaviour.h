@@ -70,7 +70,7 @@ class Misbehaviour {
   std::uint64_t generation() const;
 
  private:
-  mutable Mutex _mutex{LockRank::leaf};
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);
   std::minstd_rand _draw GUARDED_BY(_mutex);  // never seeded: every run draws alike

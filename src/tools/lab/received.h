@@ -45,7 +45,7 @@ class Received {
   int _file = -1;
   std::uint64_t _firstByte = 0;
 
-  mutable Mutex _mutex{LockRank::leaf};
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::uint64_t _endByte GUARDED_BY(_mutex) = 0;
   std::uint64_t _count GUARDED_BY(_mutex) = 0;
