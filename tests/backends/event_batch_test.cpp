@@ -1,0 +1,99 @@
+// The bounds and sums of a batch, and what happens to it while the session ID changes or memory runs out.
+#include "backends/https/event_batch.h"
+
+#include <gtest/gtest.h>
+
+#include "backends/https/held_events.h"
+#include "platform/counters.h"
+
+namespace veltrad {
+namespace {
+
+Dictionary event(int number) {
+  return {{"_sessionID", "old"}, {"number", number}};
+}
+std::size_t charged(const std::vector<Dictionary>& events) {
+  std::size_t sum = 0;
+  for (const Dictionary& one : events) sum += sizeOfEvent(one).charged;
+  return sum;
+}
+
+TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
+  EventBatch batch;
+  const EventSize half{EventBatch::kMostBytes / 2, 10};
+  EXPECT_FALSE(batch.full({EventBatch::kMostBytes, 0}));
+  EXPECT_TRUE(batch.full({EventBatch::kMostBytes + 1, 0}));
+  batch.add(5, event(0), half, 7);
+  EXPECT_FALSE(batch.full(half));
+  EXPECT_TRUE(batch.full({half.json + 1, 0}));
+  batch.dropOldest();
+  batch.dropOldest();  // of none
+  EXPECT_EQ(batch.chargedBytes(), 0u);
+  const EventSize small = sizeOfEvent(event(1));
+  for (std::size_t i = 0; i < EventBatch::kMostEvents; ++i) {
+    ASSERT_FALSE(batch.full(small));
+    batch.add(i % 2 == 0 ? 5 : 6, event(1), small, i);
+  }
+  EXPECT_TRUE(batch.full({}));
+  EXPECT_TRUE(batch.thresholdReached(5, 2048) && !batch.thresholdReached(5, 2049));  // one was dropped
+  EXPECT_TRUE(batch.thresholdReached(6, 2047) && !batch.thresholdReached(6, 2048));
+  EXPECT_TRUE(batch.thresholdReached(7, -1) && !batch.thresholdReached(7, 0));
+  batch.restartCount(5);
+  EXPECT_FALSE(batch.thresholdReached(5, 0));
+  batch.dropOldest();
+  EXPECT_EQ(batch.oldestTurn(), 1u);
+  batch.setSessionID("a much longer one than before");
+  const std::size_t sum = batch.chargedBytes();
+  batch.discard();
+  EXPECT_TRUE(batch.thresholdReached(6, 2047) && batch.chargedBytes() == 0);
+  batch.add(6, event(2), small, 9);
+  EXPECT_EQ(batch.take(), std::vector{event(2)});
+  EXPECT_TRUE(!batch.thresholdReached(6, 0) && batch.size() == 0 && !batch.oldestTurn());
+  Dictionary renamed = event(1);
+  renamed.set("_sessionID", "a much longer one than before");
+  EXPECT_EQ(sum, charged(std::vector(EventBatch::kMostEvents - 1, renamed)));
+}
+
+TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
+  platform::Counters counters;
+  const EventSize size = sizeOfEvent(event(1));
+  platform::MemoryBounds bounds;
+  bounds.userKept = 3 * size.charged;
+  platform::MemoryBudget budget(bounds);
+  const auto account = budget.accountOf(1);
+  const auto held = std::make_shared<HeldEvents>(counters);
+  account->add(held);
+  const auto add = [&](int number, std::uint64_t built) {
+    auto charge = account->keep(size.charged);
+    ASSERT_TRUE(charge);
+    held->add(5, event(number), size, std::move(*charge), account->nextTurn(), built);
+  };
+  const auto built = held->sessionIDChanges();
+  for (int number : {1, 2, 3, 4}) add(number, built);  // the first makes room for the fourth
+  EXPECT_EQ(counters.value("event dropped: its user keeps too much"), 1u);
+  EXPECT_EQ(account->used(), 3 * size.charged);
+  held->setSessionID(std::string(size.charged / 32, 'n'));  // longer ones keep more: not all of them fit
+  EXPECT_EQ(counters.value("event dropped: its user keeps too much"), 2u);
+  EXPECT_LE(account->used(), bounds.userKept);
+  held->setSessionID("new");
+  add(5, built);  // built before, added after
+  auto taken = held->take();
+  EXPECT_EQ(taken.charge.bytes(), account->used());
+  EXPECT_EQ(account->used(), charged(taken.events));
+  std::string numbers;
+  for (const Dictionary& one : taken.events)
+    numbers += std::to_string(*one.uint32("number")) + *one.string("_sessionID") + " ";
+  EXPECT_EQ(numbers, "3new 4new 5new ");
+  taken.charge.release();
+  add(6, held->sessionIDChanges());
+  EXPECT_EQ(held->needOf(5, 0, size), HeldEvents::Need::flush);
+  EXPECT_EQ(held->needOf(5, 1, size), HeldEvents::Need::room);
+  EXPECT_EQ(held->needOf(5, 1, {EventBatch::kMostBytes, 0}), HeldEvents::Need::bound);
+  held->add(5, event(7), {EventBatch::kMostBytes, size.charged}, *account->keep(size.charged), 9, 2);
+  EXPECT_EQ(counters.value("event dropped: the batch is full"), 1u);
+  EXPECT_EQ(held->discard(), 1u);
+  EXPECT_EQ(account->used(), 0u);
+}
+
+}  // namespace
+}  // namespace veltrad
