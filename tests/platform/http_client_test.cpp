@@ -274,31 +274,6 @@ TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOu
   EXPECT_TRUE(hung.waitForRequests(7));  // it reached even the host that hangs
 }
 
-TEST_F(HTTPClientTest, UploadsKeepNeitherLogDataNorPostsWaiting) {
-  const Server slow({R"({"path": "/slow", "stall": true})"});
-  std::vector<std::future<HTTPResult>> uploads, late;
-  for (const char* path : {"/", "/slow"}) {
-    for (int i = 0; i < 6; ++i) {
-      HTTPRequest request = post(slow.url(path), std::string(200'000, 'u'), HTTPRequest::Lane::upload);
-      request.leastBytesPerSecond = 1024;
-      uploads.push_back(start(std::move(request)));
-    }
-  }
-  for (std::size_t i = 0; i < 6; ++i) EXPECT_TRUE(uploads[i].get().ok());
-  ASSERT_TRUE(slow.waitForRequests(9));
-  EXPECT_TRUE(client.perform(post(slow.url(), "1")).ok());
-  EXPECT_TRUE(client.perform(post(slow.url(), "2", HTTPRequest::Lane::logData)).ok());
-  EXPECT_EQ(slow.requests().size(), 11u);  // three uploads of those that hang
-  // The time of the fourth begins when the first three have used up theirs.
-  for (const Server* server : {&hung, &hung, &hung, &healthy}) {
-    HTTPRequest request = post(server->url(), "3", HTTPRequest::Lane::logData);
-    request.timeout = 400ms;
-    late.push_back(start(std::move(request)));
-  }
-  EXPECT_TRUE(late[3].get().ok());
-  EXPECT_FALSE(late[0].get().ok());
-}
-
 TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
   std::atomic<int> first{0}, second{0};
   {
