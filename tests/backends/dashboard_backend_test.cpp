@@ -1,7 +1,6 @@
 // The dashboard back end at its door: datagrams as a real socket receives them, and the lines that come back.
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/socket.h>
 
 #include <filesystem>
@@ -9,6 +8,7 @@
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
+#include "fakes/few_descriptors.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
 #include "platform/file_descriptor.h"
@@ -201,17 +201,12 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   EXPECT_GT(world.counters.value("datagram given up: no memory to await its acknowledgement"), 5u);
   EXPECT_EQ(world.counters.value("datagram sent"), 25u);
 
-  rlimit before{};
-  ::getrlimit(RLIMIT_NOFILE, &before);
-  const platform::FileDescriptor lowest(::dup(0));
-  const rlimit full{rlim_t(lowest.get()), before.rlim_max};
-  ::setrlimit(RLIMIT_NOFILE, &full);
+  const FewDescriptors none;
   std::vector<std::shared_ptr<VeltraBackend>> made;
   for (int i = 0; i < 3; ++i) made.push_back(make({}, {account}));
   log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
   const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
   EXPECT_EQ(world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
-  ::setrlimit(RLIMIT_NOFILE, &before);
 }
 
 }  // namespace

@@ -1,7 +1,6 @@
 // How connections begin and end: greeting, refusals, broken frames, descriptors, floods, the stop.
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/resource.h>
 
 #include "harness.h"
 
@@ -206,30 +205,6 @@ TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
     ASSERT_TRUE(door.journal.waitForLines(9 * (round + 1)));
   }
   EXPECT_EQ(door.journal.lines().size(), 27u) << "the boasting client was ended";
-}
-
-TEST(Listener, ComesThroughAFullTableOfDescriptors) {
-  Door door;
-  WireEnd before = door.client();
-  rlimit usual{};
-  ASSERT_EQ(::getrlimit(RLIMIT_NOFILE, &usual), 0);
-  const rlimit few{256, usual.rlim_max};
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &few), 0);
-  std::vector<platform::FileDescriptor> fill;
-  do {
-    fill.emplace_back(::open("/dev/null", O_RDONLY | O_CLOEXEC));
-  } while (fill.back().isOpen());
-  ASSERT_EQ(errno, EMFILE);
-  fill.erase(fill.end() - 2);  // for the client
-  WireEnd refused = door.stranger();
-  EXPECT_EQ(refusalOf(refused), "Connection refused: the daemon has no descriptor left; try again later.");
-  before.send(messageFrame(1));
-  EXPECT_EQ(before.next().callID, 1u);
-  fill.clear();
-  ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &usual), 0);
-  door.client();
-  door.log.expectLine(platform::LogLevel::warning,
-                      "listener: A connection could not be accepted: Too many open files");
 }
 
 }  // namespace

@@ -4,13 +4,13 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 
 #include <csignal>
 #include <future>
 #include <thread>
 
 #include "base/json.h"
+#include "fakes/few_descriptors.h"
 #include "fakes/temporary_directory.h"
 #include "tools/lab/server.h"
 
@@ -185,22 +185,6 @@ TEST_F(HTTPClientTest, ABodyIsReadFromItsFile) {
   ASSERT_EQ(healthy.requests().size(), 2u);
   EXPECT_TRUE(*healthy.requests()[1].string("body") == text.substr(1, text.size() - 2));
 }
-
-// Lets `free` further descriptors be opened until it goes.
-class FewDescriptors {
- public:
-  explicit FewDescriptors(unsigned free) {
-    getrlimit(RLIMIT_NOFILE, &_before);
-    FileDescriptor next[4];
-    for (FileDescriptor& one : next) one.reset(dup(STDIN_FILENO));
-    const rlimit few{static_cast<rlim_t>(next[free].get()), _before.rlim_max};
-    setrlimit(RLIMIT_NOFILE, &few);
-  }
-  ~FewDescriptors() { setrlimit(RLIMIT_NOFILE, &_before); }
-
- private:
-  rlimit _before{};
-};
 
 TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
   for (const bool started : {false, true}) {  // the HTTP thread

@@ -3,28 +3,14 @@
 
 #include <gtest/gtest.h>
 #include <openssl/x509_vfy.h>
-#include <sys/resource.h>
 
+#include "fakes/few_descriptors.h"
 #include "fakes/recorded_log.h"
 #include "fakes/temporary_directory.h"
 #include "tools/lab/certificate.h"
 
 namespace veltrad::platform {
 namespace {
-
-// No file can be opened while it lives.
-class NoDescriptor {
- public:
-  NoDescriptor() {
-    ::getrlimit(RLIMIT_NOFILE, &_before);
-    const rlimit none{0, _before.rlim_max};
-    ::setrlimit(RLIMIT_NOFILE, &none);
-  }
-  ~NoDescriptor() { ::setrlimit(RLIMIT_NOFILE, &_before); }
-
- private:
-  rlimit _before{};
-};
 
 int certificatesIn(X509_STORE* store) {
   return store ? sk_X509_OBJECT_num(X509_STORE_get0_objects(store)) : -1;
@@ -38,14 +24,14 @@ TEST(TrustStore, IsNeverWithoutWhatItCouldNotReadJustNow) {
   ASSERT_FALSE(lab::makeCertificate(path, directory.path("key.pem")));
   TrustStore trust(path);
   {
-    const NoDescriptor shortage;
+    const FewDescriptors none;
     EXPECT_EQ(certificatesIn(trust.current()), -1);
   }
   EXPECT_EQ(certificatesIn(trust.current()), system + 1);
   // A new file: until it can be read, those of the old one are trusted.
   directory.write("ca.pem", directory.read("ca.pem") + "\n");
   {
-    const NoDescriptor shortage;
+    const FewDescriptors none;
     EXPECT_EQ(certificatesIn(trust.current()), system + 1);
   }
 }
