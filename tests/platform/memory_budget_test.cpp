@@ -13,14 +13,14 @@ namespace {
 using enum MemoryUse;
 
 TEST(MemoryBudget, HoldsEachBoundToTheByteAndGetsAllBack) {
+  const MemoryBounds alone{100, 90, 80, 190, 180}, crowded{100, 90, 80, 110, 105};
   const struct {
-    MemoryBounds bounds;  // user, userKept, userUnfinished, all, allKept
+    MemoryBounds bounds;
     MemoryUse use;
     std::size_t mine, others, fits;  // bytes of that use already charged, and what then fits
-  } table[] = {
-      {{100, 90, 80, 190, 180}, working, 30, 0, 70},    {{100, 90, 80, 190, 180}, kept, 30, 0, 60},
-      {{100, 90, 80, 190, 180}, unfinished, 30, 0, 50}, {{100, 90, 80, 110, 105}, working, 30, 50, 30},
-      {{100, 90, 80, 110, 105}, kept, 30, 50, 25},      {{100, 90, 80, 110, 105}, unfinished, 30, 50, 25}};
+  } table[] = {{alone, working, 30, 0, 70},    {alone, kept, 30, 0, 60},
+               {alone, unfinished, 30, 0, 50}, {crowded, working, 30, 50, 30},
+               {crowded, kept, 30, 50, 25},    {crowded, unfinished, 30, 50, 25}};
   for (const auto& c : table) {
     MemoryBudget budget(c.bounds);
     const auto mine = budget.accountOf(1), other = budget.accountOf(2);
@@ -32,7 +32,7 @@ TEST(MemoryBudget, HoldsEachBoundToTheByteAndGetsAllBack) {
       EXPECT_FALSE(mine->tryCharge(c.fits + 1, c.use)) << c.fits << again;
       EXPECT_FALSE(charges[0]->resize(c.mine + c.fits + 1));
     }
-    if (c.use == unfinished) EXPECT_EQ(mine->unfinishedFull(50) || !mine->unfinishedFull(51), false);
+    if (c.use == unfinished) EXPECT_TRUE(!mine->unfinishedFull(50) && mine->unfinishedFull(51));
     charges.push_back(mine->tryCharge(c.fits, c.use));
     ASSERT_TRUE(charges.back()) << c.fits;
     EXPECT_EQ(budget.used(), c.mine + c.others + c.fits);
