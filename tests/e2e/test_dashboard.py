@@ -16,11 +16,8 @@ ONE_SHOT = "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:"
 
 
 class Dashboard(HTTPSTest):
-    def section(self, port="${dashboardPort}", **more):
-        return {"ip": "127.0.0.1", "port": port, "display_url": "https://dash.example/1", **more}
-
-    def report_to(self, *entries, **section):
-        backends = {"dashboard": self.section(**section)}
+    def report_to(self, *entries, port="${dashboardPort}", **more):
+        backends = {"dashboard": {"ip": "127.0.0.1", "port": port, "display_url": "https://dash.example/1", **more}}
         if entries:
             backends["httppost"] = {"clients": list(entries)}
         self.lab.put("quindle", {"version": "v", "release": backends})

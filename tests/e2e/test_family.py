@@ -3,8 +3,8 @@ import concurrent.futures
 import re
 import time
 
-from harness import Wire, storebag, wait_until
-from test_https import NAMES, Client, HTTPSTest, entry
+from harness import storebag, wait_until
+from test_https import Client, HTTPSTest, entry
 
 ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
 BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
@@ -16,12 +16,8 @@ class Member(Client):
     """A session of the family, which keeps the copies that it gets."""
 
     def __init__(self, root, client_type, aggregates=False, name="phone", service="ringer", batch=False):
-        Wire.__init__(self, root)
-        self.copies, self.number, self.client_type = [], next(self.numbers), client_type
-        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=aggregates,
-                 sessionInfo={"clientType": client_type, "sessionID": self.number, "requireUserInfo": True,
-                              "batchEvent": batch}, userInfo={"clientName": name, "serviceName": service})
-        self.backends = self.start()
+        self.copies = []
+        super().__init__(root, name, client_type, {"serviceName": service}, aggregates, batchEvent=batch)
 
     def frame(self):
         while (frame := super().frame()) and frame[0] == self.EVENT:

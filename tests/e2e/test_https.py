@@ -34,10 +34,10 @@ class Client(Wire):
     """A started session. Every reply must be the one to the call that was made last."""
     numbers = itertools.count(1)
 
-    def __init__(self, root, name="phone", client_type=7, user_info={}, **session_info):
+    def __init__(self, root, name="phone", client_type=7, user_info={}, aggregates=False, **session_info):
         super().__init__(root)
         self.number = next(self.numbers)
-        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=False,
+        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=aggregates,
                  sessionInfo={"clientType": client_type, "sessionID": self.number, "requireUserInfo": True,
                               **session_info}, userInfo={"clientName": name, "serviceName": name, **user_info})
         self.backends = self.start()

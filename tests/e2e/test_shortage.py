@@ -6,7 +6,7 @@ import resource
 import shutil
 import subprocess
 
-from harness import DEADLINE, DEVICE, SystemTest, Wire, program, wait_until
+from harness import DEADLINE, DEVICE, START, SystemTest, Wire, program, wait_until
 
 
 class Shortage(SystemTest):
@@ -58,12 +58,10 @@ class Shortage(SystemTest):
             client.describe()
             self.limit(daemon, 0)
             for _ in range(2):
-                reply = client.call("startConfigWithCompletionHandler:")
-                self.assertNotIn("httppost", reply["results"].get("backends", []))
+                self.assertNotIn("httppost", client.call(START)["results"].get("backends", []))
             self.assertEqual(self.lab.storebags(), [])
             self.limit(daemon)
-            reply = client.call("startConfigWithCompletionHandler:")
-            self.assertEqual(reply["results"]["backends"], ["httppost"])
+            self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
             client.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"after": True})
             event, = self.lab.wait_for_events(1, after=True)
             self.assertEqual(event["_build"], DEVICE["BuildVersion"])

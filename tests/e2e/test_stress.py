@@ -49,32 +49,25 @@ class Crowd:
     def message(self):
         return {"category": 5, "type": self.random.randrange(2, 9), "payload": {"text": "x" * self.random.randrange(900)}}
 
-    def ask(self, wire):
-        self.answered(wire, "sendMessageWithDictionary:reply:", message=self.message())
-
     def pour(self, wire):
         for _ in range(50):
             wire.send(Wire.CALL, {"op": "sendMessageWithDictionary:reply:", "args": {"message": self.message()}})
 
-    def change(self, wire):
-        self.answered(wire, "fetchStatesWithUserInfo:completionHandler:", userInfo=self.identity())
-
-    def flush(self, wire):
-        self.answered(wire, "flushMessagesWithCompletion:")
-
-    def restart(self, wire):
-        self.answered(wire, "startConfigWithCompletionHandler:")
-
-    def once(self, wire):
-        self.answered(wire, "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:", category=5, type=2,
-                      sessionInfo=self.info(), userInfo=self.identity(), payload={})
+    def call(self, wire):
+        op, args = self.random.choice((
+            ("fetchStatesWithUserInfo:completionHandler:", {"userInfo": self.identity()}),
+            ("flushMessagesWithCompletion:", {}), ("startConfigWithCompletionHandler:", {}),
+            ("sendMessageWithDictionary:reply:", {"message": self.message()}),
+            ("sendMessageWithSessionInfo:userInfo:category:type:payload:reply:", {
+                "category": 5, "type": 2, "sessionInfo": self.info(), "userInfo": self.identity(), "payload": {}})))
+        self.answered(wire, op, **args)
 
     def leave(self, wire):
         self.sessions.remove(wire)
         wire.close()
 
     def go_on(self):
-        deeds = (self.ask, self.pour, self.change, self.flush, self.restart, self.once, self.leave)
+        deeds = (*[self.call] * 5, self.pour, self.leave)
         while True:
             joins = len(self.sessions) < 2 or (len(self.sessions) < SESSIONS and self.random.random() < 0.3)
             (self.join if joins else self.random.choice(deeds))(self.random.choice(self.sessions or [None]))
