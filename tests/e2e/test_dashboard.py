@@ -152,11 +152,10 @@ class Dashboard(HTTPSTest):
 
     def test_the_end_waits_for_acknowledgements_but_not_for_ever(self):
         self.report_to(reliable=PERIOD)
-        daemon = self.daemon()
-        client = self.client()
-        self.lab.control(path="/dashboard", ack="drop")
-        client.message(number=1)
-        self.assertLess(daemon.stop(), 10)
+        with self.serving():
+            client = self.client()
+            self.lab.control(path="/dashboard", ack="drop")
+            client.message(number=1)
         counts = self.counts()
         # Start, message, stop: each was acknowledged, given up or said to be lost.
         self.assertEqual(counts["datagram sent"], 3)

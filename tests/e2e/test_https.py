@@ -146,6 +146,9 @@ class Entries(HTTPSTest):
         ({"override_dnu": 1}, "reports", "state=2"),
     ]}
 
+    def names(self):
+        return (f"case{number:03}" for number in itertools.count())
+
     def decide(self, daemon, name, changes, outcome, line, consent):
         client = self.client(name)
         self.assertEqual(client.backends, ["httppost"] if outcome in ("reports", "held") else [])
@@ -164,7 +167,7 @@ class Entries(HTTPSTest):
                          [(1 + consent) * overridden] if posts else [])
 
     def test_decisions(self):
-        names = (f"case{number:03}" for number in itertools.count())
+        names = self.names()
         cases = [(facts, next(names), *row) for facts, rows in self.DECISIONS.items() for row in rows]
         self.serve(*(entry(name, **{key: value.replace("{NAME}", name) if isinstance(value, str) else value
                                     for key, value in changes.items()}) for _, name, changes, *_ in cases))
@@ -227,7 +230,7 @@ class Entries(HTTPSTest):
         groups = [({**more, key: None}, [{**more, key: value} for value in values]) for key, values, more in self.WRONG]
         groups += [({outer: [around]}, [{outer: [{**around, key: value}]} for value in values])
                    for outer, around, key, values in self.WRONG_INSIDE]
-        names = (f"case{number:03}" for number in itertools.count())
+        names = self.names()
         named = [(next(names), absent, [(next(names), wrong) for wrong in wrongs]) for absent, wrongs in groups]
         self.serve(*(entry(name, **{**({"service": name} if "client" in changes else {}), **changes})
                      for first, absent, wrongs in named for name, changes in [(first, absent), *wrongs]))
@@ -303,9 +306,8 @@ class Events(HTTPSTest):
             silent.close()
             heard.close()
             self.posts("phone", 3)
-        events = self.lab.events()
-        self.assertEqual(len(events), 4)
-        stop = next(e for e in events if (e["_method"], e["_status"]) == (0, 1))
+        self.assertEqual(len(self.lab.events()), 4)
+        stop, = self.lab.wait_for_events(1, _method=0, _status=1)
         expected = {"Opt": 0, "SamplingThreshold": -1, "OverrideSampling": 0.5, "Batch": 0, "StorebagVersion": "v1"}
         self.assertEqual({key: stop[key] for key in expected}, expected)
         self.assertEqual(self.counts()["event dropped: flushed while the back end does not report"], 3)

@@ -22,12 +22,9 @@ class Uploads(SystemTest):
 
     def setUp(self):
         super().setUp()
-        self.serve_at("${url}/upload")
+        self.lab.put("quindle", storebag(backends={"uploadserver": {"post_url": "${url}/upload"}}))
         self.files = self.root.path / "files"
         self.files.mkdir()
-
-    def serve_at(self, url):
-        self.lab.put("quindle", storebag(backends={"uploadserver": {"post_url": url}}))
 
     def make(self, name="a b.log", content=b"some lines\n" * 300):
         path = os.path.join(os.fsencode(self.files), os.fsencode(name))
@@ -171,16 +168,14 @@ class Uploads(SystemTest):
                                         "file lost: the exchange with the server failed": 2})
 
     def test_addresses(self):
-        for url, status, line in [(f"https://localhost:{closed_port()}/", 0, "post Failed to connect"),
-                                  ("https://localhost/a b", 1, "Unable to create URL request"),
-                                  ("", 1, "Unable to create URL request")]:
-            with self.subTest(url), self.serving(line, "File upload failed") as daemon:
-                self.serve_at(url)
-                self.upload(self.make(), status)
-                daemon.wait_for_line("UploadBackend(uploadFileAtPath): " + line)
-        self.lab.put("quindle", storebag(backends={"uploadserver": {"display_url": "https://x/"}}))
-        with self.serving("can't resolve upload post URL.", "File upload failed"):
-            self.assertIn("Nobody took", self.upload(self.make(), 1)[1])
+        for section, status, said, line in [
+                ({"post_url": f"https://localhost:{closed_port()}/"}, 0, "", "post Failed to connect"),
+                ({"post_url": "https://localhost/a b"}, 1, "", "Unable to create URL request"),
+                ({"display_url": "https://x/"}, 1, "Nobody took", "can't resolve upload post URL.")]:
+            with self.subTest(section), self.serving(line, "File upload failed") as daemon:
+                self.lab.put("quindle", storebag(backends={"uploadserver": section}))
+                self.assertIn(said, self.upload(self.make(), status)[1])
+                daemon.wait_for_line(line)
         self.assertEqual(os.listdir(self.files), ["a b.log"])
 
     def test_files_that_change_before_the_answer(self):

@@ -1,4 +1,5 @@
 """Hostile bytes on the socket: they cost their sender its connection and nobody else anything."""
+import contextlib
 import os
 import plistlib
 import random
@@ -17,10 +18,7 @@ class Hostile(SystemTest):
     def setUp(self):
         super().setUp()
         self.process = self.daemon()
-        self.witness = Wire(self.root)
-        self.witness.describe()
-        self.assertEqual(self.witness.call("startConfigWithCompletionHandler:")["results"]["backends"], ["httppost"])
-        self.sent = 0
+        self.witness, self.sent = self.started(), 0
 
     def tearDown(self):
         """The same process, the same session, each message once at the collector, in order."""
@@ -54,10 +52,8 @@ class Hostile(SystemTest):
             else:
                 data[5] = 1
                 data, passed = data[:rng.randrange(1, len(data))], [client.socket.fileno()]  # holds its own end
-            try:
+            with contextlib.suppress(BrokenPipeError, ConnectionResetError):
                 client.raw(bytes(data), passed)
-            except (BrokenPipeError, ConnectionResetError):
-                pass
             client.close()
             if round % 50 == 0:
                 self.unharmed()
