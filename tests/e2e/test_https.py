@@ -11,7 +11,6 @@ import pathlib
 import plistlib
 import re
 import shutil
-import socket
 import ssl
 import threading
 

@@ -4,7 +4,6 @@ import concurrent.futures
 import pathlib
 import plistlib
 import random
-import socket
 import time
 
 from harness import SystemTest, Wire, storebag, wait_until

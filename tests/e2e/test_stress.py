@@ -10,7 +10,7 @@ import sys
 import threading
 import time
 
-from harness import BUILD, DEADLINE, Root, Wire, storebag, wait_until
+from harness import BUILD, Root, Wire, wait_until
 from test_https import NAMES, HTTPSTest, entry
 
 SECONDS = float(os.environ.get("VELTRA_STRESS_SECONDS", "3"))

@@ -6,7 +6,6 @@ import resource
 import socket
 import subprocess
 import sys
-import threading
 import unittest
 
 from harness import DEVICE, SystemTest, Wire, closed_port, program, storebag, wait_until
