@@ -114,7 +114,8 @@ class Adaptor(SystemTest):
         if os.getuid() == 0:
             table += [("inside/adaptor.so", self.file, THEIRS), ("inside/step/adaptor.so", foreign / "back", THEIRS)]
         for target, fault, reason in table:
-            with self.subTest(target=target, fault=fault), self.serving(*[NONE] * bool(reason), DEAF.format("(null)")) as daemon:
+            allowed = [NONE] * bool(reason) + [DEAF.format("(null)")]
+            with self.subTest(target=target, fault=fault), self.serving(*allowed) as daemon:
                 self.file.unlink(missing_ok=True)
                 self.file.symlink_to(target)
                 def change(owner, mode):

@@ -103,7 +103,8 @@ class Dashboard(HTTPSTest):
                              (" a=1 b=long value", posted["events"][0]["_eventNumber"], True, "ab" * 20))
             self.root.prefer(DiagnosticLogSubmissionEnabled=False)
             quiet = self.client()
-            self.assertRegex(quiet.message(a=1), rf"^\d+\.\d{{3}} {'ab' * 20} 127.0.0.1 \w\w +0 +{quiet.number} +2 +5 +2  a=1$")
+            self.assertRegex(quiet.message(a=1),
+                             rf"^\d+\.\d{{3}} {'ab' * 20} 127.0.0.1 \w\w +0 +{quiet.number} +2 +5 +2  a=1$")
             client.close(), quiet.close()
         log = "".join(path.read_text() for path in pathlib.Path(self.root.path).glob("var/mobile/**/*.diag"))
         self.assertIn("[dashboard -> sendMessageWithDictionary] ", log)

@@ -39,8 +39,8 @@ class Doors(SystemTest):
         with self.serving() as daemon:
             first, second = Wire(self.root), Wire(self.root)
             accepted = daemon.wait_for_line("listener: Accepting new Vopex connection", 2)
-            self.assertRegex(accepted, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper entitlement, "
-                                       r"1\(0\) connections\.$")
+            self.assertRegex(accepted, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper "
+                                       r"entitlement, 1\(0\) connections\.$")
             first.send(Wire.CALL, b"no property list", call=7)
             kind, call, body = first.frame()
             self.assertEqual((kind, call), (Wire.REPLY, 7))

@@ -53,7 +53,7 @@ class Memory(SystemTest):
         return wait_until(settled, "memory at rest")
 
     def play(self, seed, end):
-        """One client after the other, each with messages as they come, until `end`; how many were open at once is one."""
+        """One client after the other, each with messages as they come, until `end`."""
         r = random.Random(seed)
         while time.monotonic() < end:
             wire = Wire(self.root)
@@ -93,8 +93,9 @@ class Memory(SystemTest):
         with self.serving("", env={"VELTRA_LOG": "error"}, serving=False) as daemon:
             wait_until(lambda: pathlib.Path(self.root.socket).exists(), "the socket")
             rest = self.at_rest(daemon)
-            for path, rule in (("/events", {"stall": True}), ("/realtime", {"delayMs": 3000}), ("/logdata", {"stall": True})):
-                self.lab.control(path=path, **rule)
+            for path in ("/events", "/logdata"):
+                self.lab.control(path=path, stall=True)
+            self.lab.control(path="/realtime", delayMs=3000)
             end, most = time.monotonic() + 8, 0
             with concurrent.futures.ThreadPoolExecutor(CLIENTS) as pool:
                 playing = [pool.submit(self.play, seed, end) for seed in range(CLIENTS)]

@@ -38,7 +38,8 @@ class Road(SystemTest):
         self.assertRegex(post["body"]["clientId"], "^[0-9A-F]{8}-[0-9A-F]{4}-4[0-9A-F]{3}-[89AB][0-9A-F]{3}-[0-9A-F]{12}$")
         headers = {"X-VLT-Client-Name": "phone", "X-VLT-Service-Name": "ringer", "X-VLT-Client-Version": "3",
                    "X-VLT-Sender": "JY", "X-VLT-Event-Map": "5 2", "User-Agent": "Veltra/8.2 (Elm4,2; 12.1)",
-                   "Accept": "application/json", "Content-Type": "application/json", "Content-Length": str(post["bytes"])}
+                   "Accept": "application/json", "Content-Type": "application/json",
+                   "Content-Length": str(post["bytes"])}
         self.assertEqual({key: post["headers"].get(key) for key in headers}, headers)
         self.assertNotIn("X-VLT-Internal-Build", post["headers"])
         self.assertEqual((post["method"], post["path"]), ("POST", "/events"))

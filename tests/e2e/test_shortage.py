@@ -1,4 +1,4 @@
-"""A shortage that passes, and what the process brings from whoever started it: the daemon as it ships, sandbox included,
+"""A shortage that passes, and what the process brings from whoever started it: the daemon as it ships, with its sandbox,
 with few descriptors, closed standard descriptors, a foreign environment."""
 import contextlib
 import os
@@ -110,8 +110,9 @@ class Start(SystemTest):
         self.assertFalse(keys.exists())
 
     def test_arguments(self):
-        for arguments, status, words in ((["--version"], 0, r"^veltrad 8\.\d+\n$"), (["--help"], 0, r"(?s)^Usage: veltrad.*--version"),
-                                         (["--verbose"], 2, "veltrad: .*--verbose"), (["--help", "x"], 2, "veltrad: .*x")):
+        for arguments, status, words in (
+                (["--version"], 0, r"^veltrad 8\.\d+\n$"), (["--help"], 0, r"(?s)^Usage: veltrad.*--version"),
+                (["--verbose"], 2, "veltrad: .*--verbose"), (["--help", "x"], 2, "veltrad: .*x")):
             done = subprocess.run([program("veltrad"), *arguments], env=self.root.environment(), capture_output=True,
                                   timeout=DEADLINE)
             self.assertEqual(done.returncode, status)

@@ -1,4 +1,4 @@
-"""Hundreds of sessions of few identities at once, by clients that are killed. VELTRA_STRESS_SECONDS says for how long."""
+"""Hundreds of sessions of few identities at once, by clients that are killed, for VELTRA_STRESS_SECONDS."""
 import contextlib
 import os
 import pathlib

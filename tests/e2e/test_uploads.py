@@ -38,7 +38,8 @@ class Uploads(SystemTest):
     def lend(self, wire, descriptor, path="/x/lent.log"):
         """The frames that answer an upload with this descriptor (none: -1), an event before the reply."""
         self.call = getattr(self, "call", 1000) + 1
-        wire.send(Wire.CALL, {"op": OP, "args": {"path": path}}, self.call, *((1, [descriptor]) if descriptor >= 0 else ()))
+        lent = [descriptor] if descriptor >= 0 else []
+        wire.send(Wire.CALL, {"op": OP, "args": {"path": path}}, self.call, len(lent), lent)
         frames = [wire.frame()]
         while frames[-1][0] != Wire.REPLY:
             frames.append(wire.frame())
@@ -226,7 +227,7 @@ class Uploads(SystemTest):
             resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE, (1 << 20,) * 2)
             path = self.make("noise", os.urandom(2 << 20))
             self.upload(path, status=1)
-            daemon.wait_for_line(f"No room for the compressed bytes of {os.fsdecode(path)} in {scratch}: File too large")
+            daemon.wait_for_line(f"compressed bytes of {os.fsdecode(path)} in {scratch}: File too large")
             self.assertEqual(os.listdir(scratch), files)
         self.assertTrue(os.path.exists(path))
         self.assertEqual(self.fates(), {"file uploaded": 2, "file confirmed: its removal was asked for": 2,
@@ -277,7 +278,7 @@ class Uploads(SystemTest):
 
     @unittest.skipUnless(os.getuid() == 0 and os.path.exists("/dev/fuse"), "needs the right to mount")
     def test_files_that_others_serve(self):
-        """The daemon asks nobody's file server; the library lends a copy. A mount namespace of one's own is no matter."""
+        """The daemon asks nobody's file server; the library lends a copy. One's own mount namespace is no matter."""
         place = self.root.path / "served"
         place.mkdir()
         served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})
