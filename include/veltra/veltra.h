@@ -31,8 +31,7 @@ typedef enum veltra_status {
   VELTRA_INVALID = 4,        /* an argument is not what it must be; nothing was done */
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
-  VELTRA_TOO_LARGE = 7, /* the call does not fit a frame (1 MiB, log data 16 MiB; 100,000 keys and values);
-                           nothing was sent */
+  VELTRA_TOO_LARGE = 7,      /* over 1 MiB (log data 16 MiB), 100,000 keys and values, 60 levels; not sent */
 } veltra_status;
 
 /* A short English text for a status; static. */
