@@ -1,11 +1,23 @@
 // Tells the two forms of property lists apart. Any thread.
 #include "base/property_list.h"
 
+#include "base/property_list_binary.h"
+
 namespace veltrad {
 
 Result<Value, PropertyListError> parsePropertyList(std::string_view bytes, const PropertyListLimits& limits) {
   return bytes.starts_with("bplist") ? parseBinaryPropertyList(bytes, limits)
                                      : parseXMLPropertyList(bytes, limits);
+}
+
+std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
+  using namespace binary_property_list;
+  if (!bytes.starts_with(kHeader) || bytes.size() < kHeader.size() + kTrailerSize) return std::nullopt;
+  std::uint64_t count = 0;
+  for (const char c : bytes.substr(bytes.size() - kTrailerSize + 8, 8)) {
+    count = count << 8 | static_cast<unsigned char>(c);
+  }
+  return count;
 }
 
 std::size_t objectsIn(const Value& value) {

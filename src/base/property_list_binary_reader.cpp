@@ -399,9 +399,4 @@ Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
   return Reader(bytes, limits).read();
 }
 
-std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
-  if (!bytes.starts_with(kHeader) || bytes.size() < kHeader.size() + kTrailerSize) return std::nullopt;
-  return bigEndian(bytes.data() + bytes.size() - kTrailerSize + 8, 8);
-}
-
 }  // namespace veltrad

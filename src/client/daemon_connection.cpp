@@ -392,8 +392,7 @@ void DaemonConnection::updateInterest() {
   if (_reader != Reader::waiter && (_unwaited > 0 || _handler)) wanted |= EPOLLIN;
   if (!_out.empty()) wanted |= EPOLLOUT;
   if (std::exchange(_interest, wanted) == wanted) return;
-  epoll_event socketEvent{};
-  socketEvent.events = wanted;
+  epoll_event socketEvent{wanted, {}};
   socketEvent.data.fd = _socket.get();
   ::epoll_ctl(_epoll.get(), EPOLL_CTL_MOD, _socket.get(), &socketEvent);
 }

@@ -13,8 +13,9 @@
 
 namespace veltrad::platform {
 
-// The thread starts with start(), or where none could be had then, with the first job. Jobs of one queue run in order, queues take turns, so that a long one
-// holds up another by one job at a time. Its lock is a leaf, and no job runs under it.
+// The thread starts with start(), or where none could be had then, with the first job. Jobs of one queue run
+// in order, queues take turns, so that a long one holds up another by one job at a time. Its lock is a leaf,
+// and no job runs under it.
 class DiskWriter {
  public:
   using Job = std::function<void()>;
