@@ -78,9 +78,6 @@ class Reader {
     return fail(Kind::malformed, fmt::format("object {}: {}", object.number, what));
   }
 
-  [[gnu::cold]] bool badReference(std::uint64_t number) {
-    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
-  }
   [[gnu::cold]] bool badOffset(std::uint64_t number, std::uint64_t offset) {
     return fail(Kind::malformed,
                 fmt::format("object {}: offset {} lies outside the objects", number, offset));
@@ -173,7 +170,8 @@ inline bool Reader::chargeMemory(std::uint64_t bytes) {
 }
 
 inline bool Reader::locate(std::uint64_t number, Object& object) {
-  if (number >= _count) return badReference(number);
+  if (number >= _count)
+    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
   const std::uint64_t offset = bigEndian(_bytes.data() + _table + number * _offsetSize, _offsetSize);
   if (offset < kHeader.size() || offset >= _table) return badOffset(number, offset);
   object.number = number;

@@ -132,7 +132,7 @@ class Family(HTTPSTest):
 
     def test_a_client_that_does_not_read_holds_up_nobody(self):
         with self.serving(PROXY) as daemon:
-            root, child = self.join(ROOT, aggregates=True, batch=True), self.join(CHILD)
+            root, child = self.join(ROOT, aggregates=True, batch=True), self.join(CHILD, batch=True)
             root.message(text="x" * 100_000)
             root.copies_now()
             self.lab.control(path="/events/0", stall=True)
