@@ -7,7 +7,7 @@ import socket
 import sys
 import time
 
-from harness import DEADLINE, ENTITLEMENT, Ctl, Daemon, SystemTest, Wire, wait_until
+from harness import BUILD, DEADLINE, ENTITLEMENT, Ctl, Daemon, SystemTest, Wire, wait_until
 
 
 class Doors(SystemTest):

@@ -6,7 +6,7 @@ import plistlib
 import random
 import time
 
-from harness import SystemTest, Wire, storebag, wait_until
+from harness import BUILD, SystemTest, Wire, storebag, wait_until
 
 MIB = 1 << 20
 SEND = "sendMessageWithCategory:type:payload:reply:"
@@ -35,6 +35,7 @@ def message(r):
     return {f"f{i}": r.choice(VALUES)(r) for i in range(r.choice((1, 3)))}
 
 
+@unittest.skipIf(BUILD.name in ("asan", "tsan"), "a sanitizer keeps memory of its own")
 class Memory(SystemTest):
     def resident(self, daemon):
         status = pathlib.Path(f"/proc/{daemon.popen.pid}/status").read_text()
