@@ -20,6 +20,8 @@ using Clock = std::chrono::steady_clock;
 
 // What waits for a client that has said its last word is written for so long, not longer.
 constexpr std::chrono::seconds kLastWrites{1};
+// Unfinished frames of the same user hold all that they may: most of them end soon, some never.
+constexpr std::chrono::seconds kLongestWaitForFrames{2};
 constexpr const char* kDaemonVersion = "8.0";
 
 }  // namespace
@@ -143,7 +145,8 @@ bool SocketConnection::receive() {
 bool SocketConnection::waitForRoom() {
   const auto now = Clock::now();
   if (!_lackingRoomSince) _lackingRoomSince = now;
-  if (_reader.hopeless() || now - *_lackingRoomSince > kLongestWaitForMemory) return false;
+  const auto longest = _reader.hopeless() ? kLongestWaitForFrames : kLongestWaitForMemory;
+  if (now - *_lackingRoomSince > longest) return false;
   poll(0, 100);
   return true;
 }
