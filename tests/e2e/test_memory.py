@@ -5,6 +5,7 @@ import pathlib
 import plistlib
 import random
 import time
+import unittest
 
 from harness import BUILD, SystemTest, Wire, storebag, wait_until
 
