@@ -134,7 +134,8 @@ bool SocketConnection::receive() {
         return violation("More descriptors came than a frame can carry.");
       case SocketReader::Got::noRoom:
         if (!waitForRoom()) {
-          return violation("Too many bytes of unfinished frames wait in the daemon; try again later.");
+          return endWith("connection ended: too many bytes of unfinished frames",
+                         "Too many bytes of unfinished frames wait in the daemon; try again later.");
         }
     }
   }
@@ -228,9 +229,13 @@ void SocketConnection::interrupted(const std::string& why) {
   if (_interruptionHandler) _interruptionHandler();
 }
 
-// The client broke the protocol: it is told how, and the connection ends.
 bool SocketConnection::violation(const std::string& description) {
-  _counters.count("connection ended: the client broke the protocol");
+  return endWith("connection ended: the client broke the protocol", description);
+}
+
+// The client is told why, and the connection ends.
+bool SocketConnection::endWith(std::string_view counted, const std::string& description) {
+  _counters.count(counted);
   logDebug("connection: %s ends: %s", _description.c_str(), description.c_str());
   _out->sendReply(refusalFrame(description));
   return false;

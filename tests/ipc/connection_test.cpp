@@ -205,6 +205,7 @@ TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
     ASSERT_TRUE(door.journal.waitForLines(9 * (round + 1)));
   }
   EXPECT_EQ(door.journal.lines().size(), 27u) << "the boasting client was ended";
+  EXPECT_EQ(door.counters.value("connection ended: too many bytes of unfinished frames"), 3u);
 }
 
 }  // namespace
