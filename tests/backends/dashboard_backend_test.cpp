@@ -121,51 +121,6 @@ TEST_F(Dashboard, ThePayloadBecomesText) {
   EXPECT_EQ(world.counters.value("datagram cut: its text is longer than 1023 bytes"), 1u);
 }
 
-TEST_F(Dashboard, ADeviceWithoutIdentifierAndAnUnknownComponent) {
-  const auto backend = make();
-  backend->setUdid("");
-  backend->setCompType(99);
-  EXPECT_EQ(backend->sendMessage(nullptr, {7, 999'999}, 1, 2, 0),
-            "7.996  127.0.0.1 (null)     3  4660     1     1     2 ");
-  EXPECT_EQ(server.receive().substr(3, 57),
-            "\xF9\0\0\0\x07\xFF\xFF\xED\xCB\xFF\xFC\xFF\xBF\0\1\0\2"s + std::string(40, '\0'));
-}
-
-TEST_F(Dashboard, AProfileThatNamesNoServerMakesNone) {
-  // Whether the base was made, and so has drawn, before the fault was seen.
-  struct Counting final : platform::Random {
-    double uniform() override { return ++draws, 0.5; }
-    int draws = 0;
-  } random;
-  const BackendServices& w = world.services;
-  StandardBackendFactory factory({w.http, w.clock, random, w.locale, w.preferences, w.counters, w.energyLog,
-                                  w.adaptorBundle, w.settings, w.device, w.library, w.pool, w.lentFiles});
-  const auto refused = [&](const Value& profile, int draws, const char* line,
-                           const char* name = kVeltraBackendDashboard) {
-    log.expectLine(Level::error, line);
-    const int before = random.draws;
-    EXPECT_EQ(factory.newBackendWithName(name, profile, "Desktop", 7), nullptr);
-    EXPECT_EQ(random.draws - before, draws) << line;
-  };
-  refused("text", 1, "DashboardBackend(initWithName): initWitName with all null params.");
-  refused(Dictionary{{"port", 9}}, 0, "DashboardBackend(initWithName): can't resolve server IP");
-  refused(Dictionary{{"ip", "127.0.0.1"}}, 0, "DashboardBackend(initWithName): can't resolve server port");
-  for (const char* ip : {"localhost", "127.1", "::1", "127.0.0.1 ", "1000.000.000.001", ""}) {
-    refused(Dictionary{{"ip", ip}, {"port", 9}}, 1,
-            "DashboardBackend(initWithName): can't resolve server IP");
-  }
-  refused(Dictionary{{"ip", "255.255.255.255"}, {"port", 9}}, 1,
-          "DashboardBackend(initWithName): socket connect() failed.");
-  refused(Dictionary{}, 0, "UploadBackend(initWithName): can't resolve upload post URL.",
-          kVeltraBackendUploadServer);
-  refused(Dictionary{}, 0, "HTTPSPostBackend(initWithName): can't find the client list.",
-          kVeltraBackendHTTPPost);
-  log.expectLine(Level::error, "MivoBackend(initWithName): No matching bundle found for client type 6");
-  const int before = random.draws;
-  EXPECT_EQ(factory.newBackendWithName(kVeltraBackendMivo, Dictionary{}, "Desktop", 6), nullptr);
-  EXPECT_EQ(random.draws - before, 1);
-}
-
 TEST_F(Dashboard, SoManyLingerOfAUserAndInAllAndTheOldestEnds) {
   platform::MemoryBudget budget;
   const auto threads = entries("/proc/self/task");

@@ -76,18 +76,6 @@ TEST(ConnectionEnd, EndsEveryCallOnceWhenTheDaemonGoes) {
   EXPECT_EQ(session.close(), 0u);
 }
 
-TEST(ConnectionEnd, AFrameOfImpossibleLengthOrALateRefusalEndsIt) {
-  for (const std::string& bytes :
-       {rawFrame(FrameKind::reply, "", kFrameBodyLimit + 1), ipc::makeFrame(FrameKind::refusal, 0, {})}) {
-    FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-      if (call.callID != 0) link.send(bytes);
-    });
-    veltra::Session session = open(daemon);
-    EXPECT_EQ(session.flush().status, VELTRA_NO_REPLY);
-    EXPECT_EQ(session.post(1, 1), VELTRA_NO_DAEMON);
-  }
-}
-
 TEST(ConnectionEnd, ClosingWritesOutWhatWaitsAndEndsWhatIsUnanswered) {
   Gate reading;
   Journal ended;

@@ -14,7 +14,6 @@
 
 namespace veltrad::client_test {
 
-using ::testing::Each;
 using ::testing::ElementsAre;
 
 class FakeDaemon {

@@ -1,59 +1,9 @@
-// Every way in which a session cannot be made has one line that says what to do.
+// A daemon that says nothing, and arguments that are refused before anything is sent.
 #include "client/daemon_socket.h"
 #include "harness.h"
 
 namespace veltrad::client_test {
 namespace {
-
-// @ in `expected` stands for the socket's path.
-void expectRefusal(const platform::Root& root, veltra_status status, std::string expected) {
-  veltra::Session session{{.root = root.directory()}};
-  EXPECT_FALSE(session);
-  EXPECT_EQ(session.error().status, status);
-  if (const auto at = expected.find('@'); at != std::string::npos) expected.replace(at, 1, root.socketPath());
-  EXPECT_EQ(session.error().description, expected);
-  EXPECT_EQ(session.start().error().status, VELTRA_INVALID);
-  EXPECT_EQ(session.send(1, 1).get().status, VELTRA_INVALID);
-  EXPECT_EQ(session.flush([](const veltra::Reply&) { ADD_FAILURE(); }), VELTRA_INVALID);
-  EXPECT_EQ(session.close(), 0u);
-}
-
-TEST(Refusal, NamesWhatStandsAtTheSocketsPlace) {
-  const TemporaryRoot root;
-  const std::string path = root.socketPath();
-  expectRefusal(root, VELTRA_NO_DAEMON,
-                "No daemon listens on @: start veltrad, or name its root with VELTRA_ROOT or --root.");
-  unixSocket(::bind, path);
-  expectRefusal(root, VELTRA_NO_DAEMON, "The daemon that made @ has ended: start veltrad again.");
-  std::filesystem::remove(path);
-  const auto datagrams = unixSocket(::bind, path, SOCK_DGRAM);
-  expectRefusal(root, VELTRA_NO_DAEMON,
-                "@ is a socket of another type, not the daemon's: remove it and start veltrad.");
-  expectRefusal(platform::Root("/" + std::string(200, 'r')), VELTRA_INVALID,
-                "The root is too long: the socket's path @ has 236 bytes, and at most 107 are possible; "
-                "name a shorter root with VELTRA_ROOT or --root.");
-}
-
-TEST(Refusal, TellsWhatTheDaemonSaidInPlaceOfAHello) {
-  const Dictionary error{{"domain", "d"}, {"code", -1}, {"description", "Not you."}};
-  const char* stranger = "What listens on @ does not answer like veltrad: stop it and start veltrad.";
-  const std::tuple<std::string, veltra_status, const char*> cases[] = {
-      {ipc::makeFrame(FrameKind::refusal, 0, {{"error", error}}), VELTRA_REFUSED, "Not you."},
-      {ipc::makeFrame(FrameKind::refusal, 0, {}), VELTRA_REFUSED,
-       "The daemon on @ refused the connection and gave no reason."},
-      {ipc::makeFrame(FrameKind::hello, 0, {{"wire", 2}}), VELTRA_REFUSED,
-       "The daemon on @ speaks version 2 of the wire protocol and this library 1: install both from the same "
-       "release."},
-      {ipc::makeFrame(FrameKind::event, 0, {{"wire", 1}}), VELTRA_NO_DAEMON, stranger},
-      {"HTTP/1.1 400 Bad Request\r\n\r\n", VELTRA_NO_DAEMON, stranger},
-      {"", VELTRA_NO_DAEMON,
-       "The daemon on @ ended the connection without a word: start veltrad again, or see its log."},
-  };
-  for (const auto& [greeting, status, text] : cases) {
-    FakeDaemon daemon([](WireEnd& link, const Received&) { link.hangUp(); }, greeting);
-    expectRefusal(daemon.root, status, text);
-  }
-}
 
 TEST(Refusal, OfADaemonThatSaysNothingComesInTime) {
   FakeDaemon daemon([](auto&...) {}, "");

@@ -78,44 +78,6 @@ TEST(Session, CarriesAWholeConversation) {
                   "flushMessagesWithCompletion: {}", "finishSessionWithReply: {}"));
 }
 
-TEST(Session, ReadsAnswersOfEveryKindInPiecesAndBehindOnesThatNobodyAwaits) {
-  const auto error = [](const char* description) {
-    return Dictionary{{"domain", "d"}, {"code", -7}, {"description", description}};
-  };
-  const std::tuple<Dictionary, veltra_status, std::optional<std::string>, const char*> cases[] = {
-      {{{"results", Dictionary{{"reply", "half"}, {"error", error("why")}}}}, VELTRA_OK, "half", "d -7 why"},
-      {{{"results", Dictionary{}}}, VELTRA_OK, {}, ""},
-      {{{"error", error("The daemon gave no reply.")}},
-       VELTRA_NO_REPLY,
-       {},
-       "d -7 The daemon gave no reply."},
-      {{{"error", error("No such call.")}}, VELTRA_REFUSED, {}, "d -7 No such call."},
-      {{{"nothing", "known"}},
-       VELTRA_NO_REPLY,
-       {},
-       "com.florn.veltra.error -1 The daemon's reply could not be read."}};
-  FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-    if (call.callID == 0) return;
-    link.send(replyFrame(call.callID + 1000, {{"reply", "of nobody"}}));
-    const std::string frame =
-        ipc::makeFrame(FrameKind::reply, call.callID, std::get<0>(cases[*call.args().uint16("type")]));
-    for (const char byte : frame) link.send({&byte, 1});
-  });
-  veltra::Session session = open(daemon);
-  for (std::uint16_t i = 0; i < std::size(cases); ++i) {
-    SCOPED_TRACE(i);
-    const auto& [body, status, text, described] = cases[i];
-    for (const veltra::Reply& reply : {session.sendAndWait(1, i, {}), session.send(1, i).get()}) {
-      EXPECT_EQ(reply.status, status);
-      EXPECT_EQ(reply.text, text);
-      EXPECT_FALSE(reply.backends);
-      const auto& found = reply.error;
-      EXPECT_EQ(found ? found->domain + " " + std::to_string(found->code) + " " + found->description : "",
-                described);
-    }
-  }
-}
-
 TEST(Session, CarriesCallsOutInTheOrderInWhichTheyWereMadeAndGivesEachItsOwnAnswer) {
   constexpr std::uint16_t kCalls = 600;
   std::vector<int> order;

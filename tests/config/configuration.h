@@ -40,8 +40,8 @@ struct Configuration {
     preferences.set("veltra_storebag_url", "https://bags.test/x");
     files.put(root.publicKeyPath(), RSAKey::shared().encoded());
   }
-  void answers(std::string body, platform::HTTPHeaders headers = {}, int status = 200) {
-    answer = platform::HTTPResponse{status, std::move(headers), std::move(body)};
+  void answers(std::string body, platform::HTTPHeaders headers) {
+    answer = platform::HTTPResponse{200, std::move(headers), std::move(body)};
   }
 
   platform::Root root{"/"};
@@ -53,11 +53,7 @@ struct Configuration {
   Veltra veltra{files, preferences, root};
   platform::HTTPResult answer =
       Failure{platform::HTTPError{platform::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
-  std::vector<platform::HTTPRequest> requests;  // those that were answered
-  FakeHTTPClient client{[this](platform::HTTPRequest request) {
-    requests.push_back(std::move(request));
-    return answer;
-  }};
+  FakeHTTPClient client{[this](platform::HTTPRequest) { return answer; }};
 };
 
 }  // namespace veltrad

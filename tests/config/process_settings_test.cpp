@@ -1,10 +1,9 @@
-// Where the environment and the storebag server come from.
+// Where the storebag server comes from, and what is not known during a shortage.
 #include "config/process_settings.h"
 
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <thread>
 
 #include "configuration.h"
 
@@ -12,38 +11,12 @@ namespace veltrad {
 namespace {
 
 struct Machine : Configuration {
-  Machine(bool internal, const char* key, const std::optional<Value>& preference) {
+  Machine(bool internal, const std::optional<Value>& preference) {
     preferences.clear();
-    if (preference) preferences.set(key, *preference);
+    if (preference) preferences.set("veltra_storebag_url", *preference);
     if (internal) properties.set("ReleaseType", "Internal");
   }
 };
-
-TEST(ProcessSettings, EnvironmentComesFromThePreferenceOrTheBuild) {
-  const std::tuple<std::optional<Value>, bool, std::uint32_t, const char*> table[] = {
-      {std::nullopt, true, 2, nullptr},
-      {std::nullopt, false, 3, nullptr},
-      {0, false, 0, nullptr},
-      {4.9, true, 4, nullptr},
-      {5, false, 2, "5"},
-      {-1, false, 2, "4294967295"},
-      {"4", false, 3, nullptr}};  // a text is no number, so as if it were absent
-  for (const auto& [preference, internal, environment, invalid] : table) {
-    Lines lines{"6 userDefaultsEnvironment: Environment type " + std::to_string(environment)};
-    if (invalid)
-      lines.push_back(std::string("3 userDefaultsEnvironment: Invalid environment type ") + invalid);
-    const ExpectedLog log(lines);
-    Machine machine(internal, "environmentType", preference);
-    std::vector<std::thread> first;
-    for (int i = 0; i < 4; ++i)
-      first.emplace_back(
-          [&, wanted = environment] { EXPECT_EQ(machine.settings.currentEnvironment(), wanted); });
-    for (std::thread& thread : first) thread.join();
-    machine.preferences.set("environmentType", 3);
-    EXPECT_EQ(machine.settings.currentEnvironment(), environment);
-    EXPECT_EQ(log.count(platform::LogLevel::info, "userDefaultsEnvironment: "), 1);
-  }
-}
 
 TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
   const std::string path = platform::Root("/").deploymentPath();
@@ -72,7 +45,7 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
        ": publicStorebagHost is \"a/b\", expected a host name; using storebags.example"}};
   for (const auto& c : table) {
     const ExpectedLog log(c.warning.empty() ? Lines() : Lines{"4 storebagServerURL: " + path + c.warning});
-    Machine machine(c.internal, "veltra_storebag_url", c.preference);
+    Machine machine(c.internal, c.preference);
     if (!c.deployment.empty()) machine.files.put(path, c.deployment);
     if (c.deployment == unreadable) machine.files.failReads(path, FakeFileStore::Kind::noAccess);
     EXPECT_EQ(machine.settings.storebagServerURL(), c.url);
@@ -84,7 +57,7 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
 TEST(ProcessSettings, AreNothingDuringAShortageAndRightAfterIt) {
   const std::string path = platform::Root("/").deploymentPath();
   const ExpectedLog log({});
-  Machine machine(true, "", {});
+  Machine machine(true, {});
   machine.files.put(path, writeXMLPropertyList(Dictionary{{"internalStorebagHost", "in.test"}}));
   const std::function<void(bool)> shortages[] = {[&](bool on) { machine.preferences.runShort(on); },
                                                  [&](bool on) { machine.properties.runShort(on); },

@@ -14,9 +14,7 @@ namespace veltrad {
 namespace {
 
 const Dictionary kStorebag{{"release", Dictionary{{"mivo", Dictionary{}}}}, {"version", "1.2"}};
-constexpr const char* kMonday = "Mon, 03 Mar 2025 10:00:00 GMT";
 constexpr const char* kTuesday = "Tue, 04 Mar 2025 10:00:00 GMT";
-constexpr std::int32_t kUntouched = -77;
 const std::string kAt = "fetchStorebagWithName: ";
 const std::string kNoList = "3 " + kAt + "propertyListWithData error ";
 const std::string kMissing = "3 " + kAt + "Signature is missing";
@@ -24,15 +22,13 @@ const std::string kNotVerified = "3 " + kAt + "Signature can not be verified, 0x
 
 // One call, its lines and its slots.
 struct Fetch {
-  explicit Fetch(Configuration& configuration, const Lines& lines = {},
-                 std::optional<std::string> held = std::nullopt, const std::string& name = "ostvane")
-      : lastModified(std::move(held)) {
+  Fetch(Configuration& configuration, const Lines& lines) {
     const ExpectedLog log(lines);
     StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
-    storebag = download.fetchStorebagWithName(name, maxAge, notModified, &lastModified, attempted);
+    storebag = download.fetchStorebagWithName("ostvane", maxAge, notModified, &lastModified, attempted);
   }
   std::optional<Dictionary> storebag;
-  std::int32_t maxAge = kUntouched;
+  std::int32_t maxAge = -77;
   bool notModified = false;
   bool attempted = true;
   std::optional<std::string> lastModified;
@@ -54,71 +50,29 @@ TEST(CacheControl, GivesTheMaxAgeOrADay) {
   EXPECT_EQ(maxAgeOfCacheControl(std::nullopt), 86'400);
 }
 
-TEST(StorebagDownload, TakesAVerifiedStorebagWhateverTheStatus) {
-  const std::string bag = writeBinaryPropertyList(kStorebag);
-  const Dictionary list{{"signature", " " + encodeBase64(RSAKey::shared().sign(bag)) + "\r\n"},
-                        {"bag", encodeBase64(bag)},
-                        {"more", Array{1}}};
-  for (const auto& [status, body] :
-       {std::pair(200, container(writeXMLPropertyList(kStorebag))), {500, writeBinaryPropertyList(list)}}) {
-    Configuration configuration;
-    configuration.answers(body, {{"cache-control", "max-age=600"}, {"last-modified", kTuesday}}, status);
-    const Fetch fetch(configuration, {}, kMonday);
-    EXPECT_EQ(fetch.storebag, kStorebag);
-    EXPECT_EQ(fetch.maxAge, 600);
-    EXPECT_FALSE(fetch.notModified);
-    EXPECT_EQ(fetch.lastModified, kTuesday);
-    ASSERT_EQ(configuration.requests.size(), 1u);
-    const platform::HTTPRequest& request = configuration.requests[0];
-    EXPECT_EQ(request.method, platform::HTTPRequest::Method::get);
-    EXPECT_EQ(request.lane, platform::HTTPRequest::Lane::storebag);
-    EXPECT_EQ(request.headers, (platform::HTTPHeaders{{"If-Modified-Since", kMonday}}));
-  }
-}
-
-TEST(StorebagDownload, FallsBackForQuindleAloneAndIsNoAttemptForAShortageOrAStop) {
-  using Kind = platform::HTTPError::Kind;
-  const Dictionary section{{"mivo", Dictionary{{"active", true}}}};
-  const std::optional<Dictionary> standIn{{{"florn_internal", section},
-                                           {"development", section},
-                                           {"release", section},
-                                           {"version", "1.0.0-Quindle-Fallback"},
-                                           {"refresh_cycle", 3600}}};
-  const struct {
-    Kind kind;
-    bool attempted, standsIn;
-    Lines lines;
-  } table[] = {{Kind::shortage, false, true, {}},
-               {Kind::stopping, false, false, {}},
-               {Kind::tooLarge, true, false, {kNoList, kMissing}},
-               {Kind::transport, true, true, {}}};
-  for (const auto& c : table) {
-    Configuration configuration;
-    configuration.answer = Failure{platform::HTTPError{c.kind, "why", 200}};
-    const Fetch quindle(configuration, c.lines, kMonday, "quindle"), other(configuration, c.lines, kMonday);
-    EXPECT_EQ(quindle.attempted, c.attempted);
-    EXPECT_EQ(quindle.storebag, c.standsIn ? standIn : std::nullopt);
-    if (c.standsIn) EXPECT_EQ(quindle.maxAge, kUntouched);
-    EXPECT_EQ(other.attempted, c.attempted);
-    EXPECT_EQ(other.storebag, std::nullopt);
-    EXPECT_EQ(other.lastModified, kMonday);
-  }
-  // What is read before and after the exchange.
+// What is read before the exchange and after it, and the exchange itself.
+TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
   Configuration configuration;
-  configuration.answers(container(writeXMLPropertyList(kStorebag)));
+  const auto isNone = [&](const std::string& what) {
+    const Fetch fetch(configuration, {});
+    EXPECT_FALSE(fetch.attempted) << what;
+    EXPECT_EQ(fetch.storebag, std::nullopt) << what;
+  };
   configuration.preferences.runShort(true);
-  EXPECT_FALSE(Fetch(configuration).attempted);
+  isNone("preferences");
   configuration.preferences.runShort(false);
+  configuration.answer = Failure{platform::HTTPError{platform::HTTPError::Kind::shortage, "why"}};
+  isNone("exchange");
+  configuration.answers(container(writeXMLPropertyList(kStorebag)), {});
   for (const std::string& path :
        {configuration.root.packageManifestPath(), configuration.root.publicKeyPath()}) {
     configuration.files.failReads(path, FakeFileStore::Kind::shortage);
-    const Fetch fetch(configuration);
-    EXPECT_FALSE(fetch.attempted) << path;
-    EXPECT_EQ(fetch.storebag, std::nullopt);
+    isNone(path);
     configuration.files.failReads(path, {});
   }
-  EXPECT_EQ(configuration.requests.size(), 1u);
-  EXPECT_EQ(Fetch(configuration).storebag, kStorebag);
+  const Fetch after(configuration, {});
+  EXPECT_EQ(after.storebag, kStorebag);
+  EXPECT_TRUE(after.attempted);
 }
 
 TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {

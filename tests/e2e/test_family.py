@@ -4,7 +4,7 @@ import re
 import time
 
 from harness import storebag, wait_until
-from test_https import Client, HTTPSTest, entry
+from test_https import NAMES, Client, HTTPSTest, entry
 
 ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
 BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
@@ -108,6 +108,16 @@ class Family(HTTPSTest):
             grandchild.message(number=5)
             self.assertEqual(grandchild.flush()[1:], (None, None))
             self.assertEqual(self.ids(2, 5).count("."), 1)
+
+    def test_a_session_whose_user_info_has_gone_is_forgotten(self):
+        with self.serving("user info provided without requiring it") as daemon:
+            member = self.join(ROOT)
+            member.ask(NAMES, sessionInfo={"clientType": ROOT, "sessionID": member.number}, userInfo={},
+                       frameworksToCheck=[], hasAggregationBlock=False)
+            self.leave(daemon, member)
+            child = self.join(CHILD)
+            daemon.wait_for_line(f"syncReportingStates: child session {child.number} (backend httppost) with hierarchy 1 is "
+                                 "missing its parent")
 
     # What the entries of parent and child say, the answer of the parent's collector, whether the child reports.
     OUT, HELD = {"sampling_threshold": 0, "override_sampling": 0}, {"sampling_threshold": 0}

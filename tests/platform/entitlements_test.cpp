@@ -111,16 +111,6 @@ TEST_F(EntitlementsTest, TheLastRulesStandDuringAShortage) {
   EXPECT_FALSE(granted());
 }
 
-TEST_F(EntitlementsTest, ARuleThatCanNeverMatchIsNamedOnce) {
-  put({rule({{"uid", 1'000}}), rule({}), rule({{"gid", "wheel"}}), Dictionary{{"uid", 1}}, 5});
-  for (const char* text :
-       {"rule 1 grants nothing: expected \"uid\", \"gid\" or \"unit\"", "rule 2 grants nothing: \"gid\"",
-        "rule 3 grants nothing: expected a dictionary under \"entitlements\"",
-        "rule 4 grants nothing: expected a dictionary"})
-    _log.expectLine(LogLevel::warning, text);
-  for (int i = 0; i < 2; ++i) EXPECT_EQ(granted(), Value(true));
-}
-
 TEST(SystemUnit, IsTheFirstBelowTheSlicesAndNeverAUsers) {
   for (const std::string row :
        {"/system.slice/x.service x.service", "/system.slice/system-foo.slice/foo@1.service foo@1.service",

@@ -79,22 +79,5 @@ TEST_F(DiskFileStoreTest, ReadsWithinItsBoundAndRegularFilesAlone) {
   EXPECT_EQ(_files.read("/proc/self/status", 10).error().kind, Kind::tooLarge);
 }
 
-TEST_F(DiskFileStoreTest, TheStampChangesWithEveryKindOfChange) {
-  const std::string path = _directory.path("x");
-  EXPECT_FALSE(stampOf(path));
-  _directory.write("x", "1");
-  const auto first = stampOf(path);
-  ASSERT_TRUE(first);
-  EXPECT_EQ(stampOf(path), first);
-  ASSERT_FALSE(_files.replace(path, "1", 0600));
-  const auto second = stampOf(path);
-  EXPECT_NE(second, first);
-  _directory.write("x", "12");
-  EXPECT_NE(stampOf(path), second);
-  ASSERT_FALSE(_files.rename(path, path + ".corrupt"));
-  EXPECT_FALSE(stampOf(path));
-  EXPECT_EQ(_directory.read("x.corrupt"), "12");
-}
-
 }  // namespace
 }  // namespace veltrad::platform

@@ -1,7 +1,6 @@
 // The HTTP client against the lab's real TLS server on loopback.
 #include "platform/http_client.h"
 
-#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -105,32 +104,6 @@ class HTTPClientTest : public testing::Test {
     EXPECT_THAT(r.error().description, Not(testing::ContainsRegex("[\r\n]"))); \
   } while (false)
 
-TEST_F(HTTPClientTest, SendsExactlyWhatTheRequestSays) {
-  const std::string text(300'000, 'p');
-  HTTPRequest request = post(healthy.url("/a?b=c"), '"' + text + '"');
-  request.headers = {{"User-Agent", "one\r\nInjected: yes"},
-                     {"content-length", "5"},
-                     {"Transfer-Encoding", "chunked"},
-                     {"Bad\r\nName", "value"},
-                     {"Expect", "100-continue"},
-                     {"Content-Type", "application/json"},
-                     {"X-Text", "caf\xc3\xa9\x7f"}};
-  ASSERT_TRUE(client.perform(std::move(request)).ok());
-  ASSERT_TRUE(client.perform(post(healthy.url(), "")).ok());
-  const auto requests = healthy.requests();
-  ASSERT_EQ(requests.size(), 2u);
-  const std::string host = healthy.url("").substr(8);
-  EXPECT_EQ(*requests[0].dictionary("headers"), (Dictionary{{"Host", host},
-                                                            {"User-Agent", "oneInjected: yes"},
-
-                                                            {"Content-Type", "application/json"},
-                                                            {"X-Text", "caf\xc3\xa9"},
-                                                            {"Content-Length", "300002"}}));
-  EXPECT_EQ(*requests[0].string("path"), "/a?b=c");
-  EXPECT_EQ(*requests[0].string("body"), text);
-  EXPECT_EQ(*requests[1].dictionary("headers"), (Dictionary{{"Host", host}, {"Content-Length", "0"}}));
-}
-
 TEST_F(HTTPClientTest, AnswersAreBounded) {
   const auto withHeaders = [](int count, std::size_t length) {
     std::string rule = R"({"path": "/", "status": 503, "body": "short", "headers": {"X": "x")";
@@ -168,22 +141,6 @@ TEST_F(HTTPClientTest, AnswersAreBounded) {
   HTTPRequest late = get(hung.url("/x"));
   late.timeout = 300ms;
   EXPECT_TRANSPORT_ERROR(client.perform(std::move(late)), HasSubstr("time"));
-}
-
-TEST_F(HTTPClientTest, ABodyIsReadFromItsFile) {
-  std::string text(5u << 20, '"');
-  for (std::size_t i = 1; i + 1 < text.size(); ++i) text[i] = static_cast<char>('a' + (i * i / 7) % 26);
-  place.write("body", text);
-  HTTPRequest request = post(healthy.url("/x"), "");
-  request.fileBody = FileBody{
-      std::make_shared<FileDescriptor>(open(place.path("body").c_str(), O_RDONLY | O_CLOEXEC)), text.size()};
-  HTTPRequest longer = post(healthy.url("/x"), "");
-  longer.fileBody = FileBody{request.fileBody->file, text.size() + 1};
-  ASSERT_TRUE(client.perform(post(healthy.url(), "0")).ok());  // the file goes over a kept connection
-  ASSERT_TRUE(client.perform(std::move(request)).ok());
-  EXPECT_TRANSPORT_ERROR(client.perform(std::move(longer)), HasSubstr("cannot be read as far as it should"));
-  ASSERT_EQ(healthy.requests().size(), 2u);
-  EXPECT_TRUE(*healthy.requests()[1].string("body") == text.substr(1, text.size() - 2));
 }
 
 TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
@@ -243,19 +200,6 @@ TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
   EXPECT_EQ(account->used(), 0u);
   EXPECT_LE(hung.requests().size(), 8u);
   EXPECT_EQ(start(get(healthy.url())).get().error().kind, HTTPError::Kind::stopping);
-}
-
-TEST_F(HTTPClientTest, AHostThatHangsKeepsNoOtherWaitingAndWhatWaitsForItTimesOut) {
-  std::vector<std::future<HTTPResult>> waiting;
-  for (int i = 0; i < 20; ++i) {
-    HTTPRequest request = post(hung.url(), "x");
-    if (i >= 6) request.timeout = 100ms;
-    waiting.push_back(start(std::move(request)));
-  }
-  EXPECT_TRUE(start(post(healthy.url(), "y")).get().ok());
-  EXPECT_TRANSPORT_ERROR(waiting[19].get(), HasSubstr("while waiting for a connection to localhost:"));
-  auto asked = start(get(hung.url("/storebag"), HTTPRequest::Lane::storebag));
-  EXPECT_TRUE(hung.waitForRequests(7));  // it reached even the host that hangs
 }
 
 TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {

@@ -30,25 +30,6 @@ class FilePreferencesTest : public ::testing::Test {
   FilePreferences _preferences{_files, "/preferences"};
 };
 
-TEST_F(FilePreferencesTest, ReadsBothFormsAtUseAndGivesDecimalTexts) {
-  EXPECT_FALSE(_preferences.value(kDomain, "text"));
-  const Dictionary all{{"text", "t"},  {"number", 17}, {"flag", true},
-                       {"off", false}, {"real", 1.5},  {"list", Array{1}}};
-  for (const std::string& bytes : {writeBinaryPropertyList(all), writeXMLPropertyList(all)}) {
-    _files.put(kPath, bytes);
-    const std::pair<const char*, std::optional<std::string>> texts[] = {
-        {"text", "t"}, {"number", "17"}, {"flag", "1"}, {"off", "0"}, {"real", "1.5"}, {"list", {}}};
-    for (const auto& [key, text] : texts) EXPECT_EQ(_preferences.text(kDomain, key), text) << key;
-    EXPECT_EQ(_preferences.value(kDomain, "number")->toInt64(), 17);
-  }
-  // What is stored stands beside what is there, in the binary form.
-  EXPECT_TRUE(_preferences.setValue(kDomain, "new", "n"));
-  EXPECT_EQ(_files.bytes(kPath)->substr(0, 8), "bplist00");
-  EXPECT_EQ(_files.mode(kPath), 0600u);
-  EXPECT_EQ(_preferences.text(kDomain, "number"), "17");
-  EXPECT_EQ(_preferences.text(kDomain, "new"), "n");
-}
-
 TEST_F(FilePreferencesTest, PutsAMalformedFileAsideWithOneLineAndGoesOn) {
   for (const std::string& bytes :
        {std::string("bplist00rubbish"), std::string(""), writeBinaryPropertyList(Array{1})}) {

@@ -1,4 +1,4 @@
-// The process's own services: sandbox, service manager.
+// What the sandbox lets the process do.
 #include <arpa/inet.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -10,12 +10,10 @@
 #include <cerrno>
 #include <thread>
 
-#include "fakes/recorded_log.h"
 #include "fakes/unix_socket.h"
 #include "platform/child_process.h"
 #include "platform/landlock.h"
 #include "platform/sandbox.h"
-#include "platform/service_manager.h"
 
 namespace veltrad::platform {
 namespace {
@@ -83,32 +81,6 @@ TEST(Sandbox, RequiredIsFatalWhereTheKernelCannotAndAnUnknownChoiceEverywhere) {
   EXPECT_THAT(child.said, ::testing::StartsWith("VELTRA_SANDBOX is \"maybe\n"));
   EXPECT_EQ(child.said.ends_with("\nin force\n"), landlock::abi() > 0);
   EXPECT_EQ(child.said.find("without"), std::string::npos);
-}
-
-TEST(ServiceManager, TakesOneListeningSocketAndNothingElse) {
-  const struct {
-    const char* count;
-    int type;
-    const char* verdict;
-  } cases[] = {{nullptr, SOCK_STREAM, "none\n"},
-               {"1", SOCK_STREAM, "3 close-on-exec\n"},
-               {"1", SOCK_DGRAM, "the handed-over descriptor is no listening Unix stream socket\n"},
-               {"2", SOCK_STREAM, "expected one handed-over socket, got 2\n"}};
-  for (const auto& c : cases) {
-    const TemporaryDirectory directory;
-    const ChildProcess child([&](const auto& say) {
-      const auto socket = unixSocket(::bind, directory.path("s"), c.type);
-      ::listen(socket.get(), 1);
-      for (const int handed : {3, 4}) ::dup2(socket.get(), handed), ::fcntl(handed, F_SETFD, 0);
-      ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
-      if (c.count) ::setenv("LISTEN_FDS", c.count, 1);
-      const auto taken = ServiceManager().handedOverSocket();
-      const bool closes = (::fcntl(3, F_GETFD) & FD_CLOEXEC) != 0;
-      if (!taken) return say(taken.error());
-      say(taken.value() ? std::to_string(*taken.value()) + (closes ? " close-on-exec" : "") : "none");
-    });
-    EXPECT_EQ(child.said, c.verdict);
-  }
 }
 
 }  // namespace

@@ -77,32 +77,6 @@ TEST_F(MessageLogTest, KeepsTheYoungestFileOfADay) {
   }
 }
 
-// Once the directory has settled the file is held open; whatever happens to it from outside is still seen.
-TEST_F(MessageLogTest, AHeldFileIsTheCurrentOneOnlyAsLongAsAListingWouldFindIt) {
-  const std::function<void()> fromOutside[] = {
-      [&] { std::filesystem::remove(_current); },
-      [&] { std::filesystem::rename(_current, _place.path("put aside")); },
-      [&] {
-        const timespec times[] = {{_now - 90'000, 0}, {_now - 90'000, 0}};
-        ASSERT_EQ(::utimensat(AT_FDCWD, _current.c_str(), times, 0), 0);
-      },
-      [&] {
-        std::filesystem::remove_all(_place.path());
-        std::filesystem::create_directory(_place.path());
-      }};
-  for (const auto& change : fromOutside) {
-    write();
-    while (!DirectoryState::of(_place.path())->settled) std::this_thread::yield();
-    write();
-    write();
-    EXPECT_EQ(_place.read(nameAt(_now)), _line + _line + _line);
-    change();
-    write();
-    EXPECT_EQ(_place.read(nameAt(_now)), _line);
-    std::filesystem::remove(_current);
-  }
-}
-
 TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) {
   _place.write("elsewhere", "foreign");
   rlimit before{};
@@ -158,27 +132,6 @@ TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
   const std::string text = _place.read(_place.names().at(0));
   EXPECT_EQ(text.substr(0, stamp.size() + 1), stamp + "x");
   EXPECT_EQ(text.size(), 3 * (stamp.size() + megabyte.size() + 1) + (dateAt(0) + "[b -> after\n").size());
-}
-
-TEST_F(MessageLogTest, ManyThreadsMakeOneFileOfWholeLines) {
-  for (int round = 0; round < 40; ++round) {
-    std::filesystem::remove(_current);
-    std::latch begin(4);
-    std::vector<std::thread> threads;
-    for (char c = 'a'; c < 'e'; ++c) {
-      threads.emplace_back([&, c] {
-        begin.arrive_and_wait();  // so that all find no file
-        for (int i = 0; i < 5; ++i) write(std::string(300, c));
-      });
-    }
-    for (auto& thread : threads) thread.join();
-    ASSERT_THAT(_place.names(), ElementsAre(nameAt(_now)));
-    std::ifstream file(_current);
-    std::map<std::string, int> lines;
-    for (std::string line; std::getline(file, line);) ++lines[line];
-    for (char c = 'a'; c < 'e'; ++c) EXPECT_EQ(lines[dateAt(_now) + "[b -> " + std::string(300, c)], 5);
-    EXPECT_EQ(lines.size(), 4u);
-  }
 }
 
 }  // namespace

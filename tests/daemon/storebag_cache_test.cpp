@@ -1,0 +1,173 @@
+// The storebag cache: what it downloads, when, and what a failure leaves.
+#include "daemon/storebag_cache.h"
+
+#include <gtest/gtest.h>
+
+#include <condition_variable>
+#include <mutex>
+#include <thread>
+
+#include "config/storebag_source.h"
+#include "fakes/machine.h"
+#include "fakes/recorded_log.h"
+
+namespace veltrad {
+namespace {
+
+// Answers as the test says; may be told to hold an exchange until it is let go.
+struct Source final : StorebagSource {
+  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(std::int32_t, std::int32_t& maxAge,
+                                                                     std::optional<std::string>& version,
+                                                                     bool& notModified,
+                                                                     std::optional<std::string>* lastModified,
+                                                                     bool& attempted) override {
+    attempted = attempts;
+    std::unique_lock held(mutex);
+    ++fetches;
+    changed.notify_all();
+    changed.wait(held, [this] { return !hold; });
+    conditional = *lastModified;
+    maxAge = age;
+    notModified = answersNotModified;
+    if (section) version = "v" + std::to_string(fetches);
+    if (!newLastModified.empty()) *lastModified = newLastModified;
+    return section;
+  }
+  void waitForFetches(int count) {
+    std::unique_lock held(mutex);
+    ASSERT_TRUE(changed.wait_for(held, std::chrono::seconds(10), [&] { return fetches >= count; }));
+  }
+  void letGo() {
+    const std::lock_guard held(mutex);
+    hold = false;
+    changed.notify_all();
+  }
+
+  std::mutex mutex;
+  std::condition_variable changed;
+  std::optional<Dictionary> section = Dictionary{};
+  std::optional<std::string> conditional;
+  std::string newLastModified;
+  std::int32_t age = 3600;
+  bool answersNotModified = false;
+  bool attempts = true;
+  bool hold = false;
+  int fetches = 0;
+};
+
+class Cache : public ::testing::Test {
+ protected:
+  std::shared_ptr<const Dictionary> ask(std::int32_t clientType) {
+    const Lock held(_lock);
+    return cache.storebagForClientType(clientType, _lock);
+  }
+  std::optional<std::string> version(std::int32_t clientType) {
+    const Lock held(_lock);
+    return cache.versionForClientType(clientType);
+  }
+
+  RecordedLog log;
+  FakeClock clock;
+  Source source;
+  StorebagCache cache{source, clock};
+
+ private:
+  RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
+};
+
+// Nothing is recorded, so the next session asks again at once.
+TEST_F(Cache, ADownloadThatWasNoAttemptLeavesTheRecordAsItWas) {
+  source.attempts = false;
+  const Dictionary standsIn{{"mivo", Dictionary{}}};
+  source.section = std::nullopt;
+  EXPECT_EQ(ask(7), nullptr);
+  source.section = standsIn;
+  EXPECT_EQ(*ask(7), standsIn);
+  EXPECT_EQ(version(7), std::nullopt);
+  source.attempts = true;
+  const Dictionary kept{{"httppost", Dictionary{}}};
+  source.section = kept;
+  source.age = 100;
+  EXPECT_EQ(*ask(7), kept);
+  EXPECT_EQ(source.fetches, 3);
+  clock.advance(101);
+  source.attempts = false;
+  source.newLastModified = "later";
+  for (const auto& section : {std::optional(standsIn), std::optional<Dictionary>()}) {
+    source.section = section;
+    EXPECT_EQ(*ask(7), kept);
+  }
+  source.attempts = true;
+  source.answersNotModified = true;
+  EXPECT_EQ(*ask(7), kept);
+  EXPECT_EQ(source.fetches, 6);
+  EXPECT_EQ(source.conditional, std::nullopt);
+}
+
+TEST_F(Cache, TypesThatShareAStorebagShareOneDownload) {
+  EXPECT_NE(ask(7), nullptr);
+  EXPECT_EQ(ask(13), ask(7));
+  EXPECT_EQ(source.fetches, 1);
+  EXPECT_EQ(version(13), "v1");
+  clock.advance(3599);
+  ask(7);
+  EXPECT_EQ(source.fetches, 1);
+  clock.advance(1);
+  ask(7);
+  EXPECT_EQ(source.fetches, 2);
+  clock.advance(-86'400);
+  ask(7);
+  EXPECT_EQ(source.fetches, 3);
+}
+
+TEST_F(Cache, AFailureIsRetriedAfter900SecondsAndKeepsWhatWasThere) {
+  source.age = 0;
+  source.newLastModified = "Monday";
+  const auto section = ask(7);
+  log.expectLine(RecordedLog::Level::error,
+                 "fetchAndCacheStorebag: Unable to fetch storebag for client type 7");
+  source.section.reset();
+  EXPECT_EQ(ask(7), section);
+  EXPECT_EQ(source.conditional, "Monday");
+  clock.advance(899);
+  EXPECT_EQ(ask(7), section);
+  EXPECT_EQ(source.fetches, 2);
+  EXPECT_EQ(log.count(RecordedLog::Level::info,
+                      "storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds "
+                      "between attempts"),
+            1);
+  clock.advance(1);
+  source.answersNotModified = true;
+  source.age = 60;
+  EXPECT_EQ(ask(7), section);
+  EXPECT_EQ(source.fetches, 3);
+  clock.advance(59);
+  EXPECT_EQ(ask(7), section);
+  EXPECT_EQ(source.fetches, 3);
+}
+
+TEST_F(Cache, ATypeWithoutAStorebagLeavesNoRecord) {
+  source.section.reset();
+  EXPECT_EQ(ask(2), nullptr);
+  EXPECT_EQ(ask(2), nullptr);
+  EXPECT_EQ(source.fetches, 2);
+  EXPECT_EQ(version(2), std::nullopt);
+}
+
+TEST_F(Cache, OthersGoOnDuringADownloadAndTheSameNameWaits) {
+  source.hold = true;
+  std::shared_ptr<const Dictionary> first, second;
+  std::thread fetching([&] { first = ask(7); });
+  source.waitForFetches(1);
+  std::thread waiting([&] { second = ask(11); });
+  EXPECT_EQ(version(6), std::nullopt);  // the lock is free
+  source.letGo();
+  fetching.join();
+  waiting.join();
+  EXPECT_EQ(source.fetches, 1);
+  EXPECT_NE(first, nullptr);
+  EXPECT_EQ(first, second);
+}
+
+}  // namespace
+}  // namespace veltrad
