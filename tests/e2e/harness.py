@@ -90,6 +90,19 @@ class Process:
         self._stream.close()
         return status
 
+    def descriptors(self):
+        """What each leads to, but for the message log, which is opened when its first line is written."""
+        names = []
+        for link in pathlib.Path(f"/proc/{self.popen.pid}/fd").iterdir():
+            with contextlib.suppress(FileNotFoundError):  # closed meanwhile
+                names.append(os.readlink(link))
+        return sorted(name for name in names if not name.endswith("messageLog.diag"))
+
+    def status(self, key):
+        """A number of /proc/PID/status; sizes in KiB."""
+        lines = pathlib.Path(f"/proc/{self.popen.pid}/status").read_text().splitlines()
+        return int(next(line.split()[1] for line in lines if line.startswith(key + ":")))
+
     def kill(self):
         if self.popen.poll() is None:
             self.popen.kill()
@@ -407,6 +420,10 @@ class SystemTest(unittest.TestCase):
         answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]
+
+    def counts(self):
+        """What the daemon that has ended counted."""
+        return json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
 
     def ctl(self, *arguments, input="", status=0, root=None):
         """Runs veltractl to its end; its answers, and what it said on standard error."""
