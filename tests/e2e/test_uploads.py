@@ -2,7 +2,6 @@
 import hashlib
 import json
 import os
-import pathlib
 import resource
 import socket
 import subprocess
@@ -55,15 +54,9 @@ class Uploads(SystemTest):
         self.lab.received("uploads", 2)
         return sessions
 
-    def descriptors(self, process):
-        """But for the message log, which is opened when its first line is written."""
-        names = pathlib.Path(f"/proc/{process.popen.pid}/fd").iterdir()
-        return sum(os.path.islink(name) and not os.readlink(name).endswith("messageLog.diag") for name in names)
-
     def fates(self):
         """What the run that has ended counted of files."""
-        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]
-        return {key: count for key, count in counts.items() if key.startswith("file ")}
+        return {key: count for key, count in self.counts().items() if key.startswith("file ")}
 
     def test_request_and_its_file(self):
         content = os.urandom(1 << 20)  # too much to stay in memory
@@ -92,10 +85,8 @@ class Uploads(SystemTest):
         kinds = {
             "missing": (lambda path: None, "cannot be opened: No such file", REGULAR),
             "directory": (os.mkdir, "is a directory", REGULAR),
-            "directory/": (lambda path: None, "cannot be opened", REGULAR),
             "link": (lambda path: os.symlink(real, path), "is a symbolic link", REGULAR),
             "fifo": (os.mkfifo, "is a FIFO", REGULAR),
-            "socket": (lambda path: socket.socket(socket.AF_UNIX).bind(path), "is a socket", REGULAR),
             "/dev/null": (lambda path: None, "is a device", REGULAR),
             "empty": (lambda path: open(path, "w").close(), "is empty", EMPTY),
             "large": (lambda path: os.truncate(self.make("large"), 1 << 31), "has 2147483648 bytes",
@@ -114,7 +105,7 @@ class Uploads(SystemTest):
                     daemon.wait_for_line(line, seen.count(line))
             daemon.wait_for_line("File upload failed for", len(kinds))
         self.assertEqual(self.fates(),
-                         {"file refused: nothing lent, or no regular file": 7, "file refused: too large": 1,
+                         {"file refused: nothing lent, or no regular file": 5, "file refused: too large": 1,
                           "file refused: empty or unreadable": 1})
         self.assertTrue(os.path.exists(real))
         self.assertEqual(self.lab.received("uploads"), [])
@@ -134,14 +125,14 @@ class Uploads(SystemTest):
             confirm = [(Wire.EVENT, 0, {"op": "removeUploadedFile:", "args": {"call": 1001}}),
                        (Wire.REPLY, 1001, {"results": {"uploaded": True}})]
             self.assertEqual(self.lend(client, good, os.fsdecode(secret)), confirm)
-            before = self.descriptors(daemon)
+            before = daemon.descriptors()
             for name, descriptor in bad.items():
                 with self.subTest(name):
                     (_, _, reply), = self.lend(client, descriptor)
                     self.assertEqual(reply, {"results": {"uploaded": False}})
             client.send(Wire.CALL, {"op": OP, "args": {"path": "/y/silent"}}, 0, 1, [good])  # asks for no reply
             self.assertEqual([frame[0] for frame in self.lend(client, good)], [Wire.EVENT, Wire.REPLY])
-            wait_until(lambda: self.descriptors(daemon) <= before, f"descriptors back to {before}")
+            wait_until(lambda: len(daemon.descriptors()) <= len(before), f"descriptors back to {before}")
             daemon.wait_for_line(REGULAR, 5)
             daemon.wait_for_line(EMPTY, 3)
             uploads = self.lab.received("uploads", 3)
@@ -184,7 +175,6 @@ class Uploads(SystemTest):
     def test_files_that_change_before_the_answer(self):
         changes = {
             "grows": (lambda path: open(path, "ab").write(b"more"), CHANGED, None),
-            "shrinks": (lambda path: os.truncate(path, 5), CHANGED, None),
             "rewritten": (lambda path: open(path, "r+b").write(b"SOME"), CHANGED, None),
             "replaced": (lambda path: os.replace(self.make("other"), path), None, "another file has taken its place"),
             "linked": (lambda path: (os.unlink(path), os.symlink("/etc/passwd", path)), None, "another file has taken"),
@@ -220,14 +210,11 @@ class Uploads(SystemTest):
         path = self.make("noise", os.urandom(64 << 20))
         scratch = self.root.path / "var/lib/veltrad/preferences"
         with self.serving("No room for the compressed bytes", "File upload failed") as daemon:
-            def memory(key):
-                with open(f"/proc/{daemon.popen.pid}/status") as status:
-                    return int(next(line.split()[1] for line in status if line.startswith(key))) >> 10
             self.upload(self.make("first"))
-            before, files = memory("VmRSS"), os.listdir(scratch)
+            before, files = daemon.status("VmRSS"), os.listdir(scratch)
             self.upload(path)
             if BUILD.name not in ("asan", "tsan"):  # a sanitizer keeps memory of its own
-                self.assertLess(memory("VmHWM"), before + 8)
+                self.assertLess(daemon.status("VmHWM"), before + (8 << 10))
             resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE, (1 << 20,) * 2)
             path = self.make("noise", os.urandom(2 << 20))
             self.upload(path, status=1)
@@ -236,18 +223,6 @@ class Uploads(SystemTest):
         self.assertTrue(os.path.exists(path))
         self.assertEqual(self.fates(), {"file uploaded": 2, "file confirmed: its removal was asked for": 2,
                                         "file lost: no room for its compressed bytes": 1})
-
-    @unittest.skipUnless(os.getuid() == 0, "needs a second user")
-    def test_places(self):
-        """Two uploads of one user that hang, and a third that waits, leave a place to another user."""
-        self.root.path.chmod(0o755)
-        self.root.grant([{"uid": uid, "entitlements": {"com.florn.private.veltrad": True}} for uid in (0, 65534)])
-        with self.serving("The daemon is stopping", "File upload failed"):
-            self.hang(3)
-            other = subprocess.Popen(self.UPLOAD + [self.make("other")], env=self.root.environment(), user=65534,
-                                     stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-            self.assertEqual(self.lab.received("uploads", 3)[2]["query"]["filename"], "other.gz")
-        other.wait()
 
     def test_files_that_are_swapped(self):
         """Somebody exchanges the path's file with another one all the while: only what was uploaded ever goes."""
@@ -258,7 +233,7 @@ class Uploads(SystemTest):
         removed = 0
         with self.serving(CHANGED):
             session, _ = self.open()
-            before = self.descriptors(session)
+            before = session.descriptors()
             for number in range(150):
                 held = {}
                 for place in (path, spare):
@@ -275,7 +250,7 @@ class Uploads(SystemTest):
                     os.close(descriptor)
                 while left := list(self.files.iterdir()):  # the swapper moves them meanwhile
                     left[0].unlink(missing_ok=True)
-            self.assertEqual(self.descriptors(session), before)
+            self.assertEqual(session.descriptors(), before)
         swapper.kill()
         swapper.wait()
         self.assertGreater(removed, 0)
