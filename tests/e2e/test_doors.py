@@ -2,6 +2,7 @@
 import contextlib
 import multiprocessing
 import os
+import re
 import signal
 import socket
 import sys
@@ -37,23 +38,15 @@ class Doors(SystemTest):
 
     def test_lines_of_a_connection(self):
         with self.serving() as daemon:
-            first, second = Wire(self.root), Wire(self.root)
-            accepted = daemon.wait_for_line("listener: Accepting new Vopex connection", 2)
-            self.assertRegex(accepted, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper "
-                                       r"entitlement, 1\(0\) connections\.$")
-            first.send(Wire.CALL, b"no property list", call=7)
-            kind, call, body = first.frame()
-            self.assertEqual((kind, call), (Wire.REPLY, 7))
-            self.assertTrue(body["error"]["description"])
-            interrupted = daemon.wait_for_line("was interrupted")
-            self.assertRegex(interrupted, r"^<7>listener: Vopex connection to \S.* was interrupted$")
-            self.assertEqual(first.call("fetchDisplayURL:")["results"]["reply"], "URL not available")
-            first.close()
-            invalidated = daemon.wait_for_line("was invalidated")
-            self.assertEqual(invalidated, interrupted.replace("interrupted", "invalidated"))
-            second.close()
-            daemon.wait_for_line("was invalidated", 2)
-            daemon.wait_for_line("<7>dealloc: VeltradSession dealloc: 0", 2)
+            client = Wire(self.root)
+            client.send(Wire.CALL, b"no property list", call=7)
+            client.frame()
+            client.close()
+            for line in ("listener: Accepting new Vopex connection .+ as it has proper entitlement, 0(0) connections.",
+                         "listener: Vopex connection to .+ was interrupted",
+                         "listener: Vopex connection to .+ was invalidated", "dealloc: VeltradSession dealloc: 0"):
+                pattern = "<7>" + re.escape(line).replace(re.escape(".+"), ".+")
+                daemon.wait_for(lambda said: any(re.fullmatch(pattern, one) for one in said), line)
 
     def refused(self, root, words, **options):
         """A daemon that does not start: status 1 and one error line with the words."""
