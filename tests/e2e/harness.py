@@ -47,7 +47,7 @@ class Process:
     def __init__(self, arguments, env, stream="stderr", **options):
         options.setdefault(stream, subprocess.PIPE)
         options.setdefault("start_new_session", True)  # a Ctrl-C is ours; it ends them in order
-        self.lines, self._news = [], threading.Condition()
+        self.text, self._ended, self._news = [], False, threading.Condition()
         self.popen = subprocess.Popen(arguments, env=env, **options)
         self._stream = getattr(self.popen, stream)
         self._reader = threading.Thread(target=self._read, daemon=True)
@@ -56,27 +56,20 @@ class Process:
     def _read(self):
         for line in self._stream:
             with self._news:
-                self.lines.append(line.decode("utf-8", "replace").rstrip("\n"))
+                self.text.append(line.decode("utf-8", "replace").rstrip("\n"))
                 self._news.notify_all()
         with self._news:
-            self.lines.append(None)  # the end
+            self._ended = True
             self._news.notify_all()
-
-    @property
-    def text(self):
-        with self._news:
-            return [line for line in self.lines if line is not None]
 
     def wait_for(self, condition, what, deadline=DEADLINE):
         """The first true value of condition(lines)."""
         with self._news:
-            def found():
-                return condition([line for line in self.lines if line is not None])
-            self._news.wait_for(lambda: found() or None in self.lines, deadline)
-            if value := found():
+            self._news.wait_for(lambda: condition(self.text) or self._ended, deadline)
+            if value := condition(self.text):
                 return value
             raise AssertionError(f"{what}: not within {deadline} s, or the process ended; its last lines:\n" +
-                                 "\n".join(line for line in self.lines[-40:] if line))
+                                 "\n".join(self.text[-40:]))
 
     def end(self, deadline=DEADLINE):
         """Waits for the exit; the status."""
@@ -358,11 +351,11 @@ class Wire:
                 return frame[2]
         return None
 
-    def describe(self, client_type=7, aggregates=False):
-        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:",
-                         hasAggregationBlock=aggregates,
-                         sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True},
-                         userInfo={"clientName": "phone", "serviceName": "ringer"}, frameworksToCheck=[])
+    def describe(self, client_type=7, aggregates=False, user_info={}, **session_info):
+        return self.call(
+            "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=aggregates,
+            sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True, **session_info},
+            userInfo={"clientName": "phone", "serviceName": "ringer", **user_info}, frameworksToCheck=[])
 
     def close(self):
         self.socket.close()

@@ -13,7 +13,6 @@ import threading
 
 from harness import Lab, SystemTest, Wire, closed_port, storebag, wait_until
 
-NAMES = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 LOGS = "var/mobile/Library/Logs/Zentrel/Retired"
 COUNTRY = "the country is not in locale_whitelist"
 POST_ERROR = "<3>HTTPSPostBackend(postJsonMessage): post error: "
@@ -33,9 +32,8 @@ class Client(Wire):
     def __init__(self, root, name="phone", client_type=7, user_info={}, aggregates=False, **session_info):
         super().__init__(root)
         self.number = next(self.numbers)
-        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=aggregates,
-                 sessionInfo={"clientType": client_type, "sessionID": self.number, "requireUserInfo": True,
-                              **session_info}, userInfo={"clientName": name, "serviceName": name, **user_info})
+        self.describe(client_type, aggregates, {"clientName": name, "serviceName": name, **user_info},
+                      sessionID=self.number, **session_info)
         self.backends = self.start()
 
     def expect(self):
@@ -266,6 +264,12 @@ class Events(HTTPSTest):
                                 [None, secret, opus, one, None, 1]])
         self.assertNotIn('"secret"', json.dumps(post))
 
+    def test_the_limit_counts_by_the_event_s_own_method(self):
+        self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
+        with self.serving():
+            client = self.client(batchEvent=True)
+            self.assertEqual([client.message(category) is None for category in (5, 6, 7)], [True, True, False])
+
 
 class Hostile(HTTPSTest):
     TEXTS = ['"quoted\\"', "line\r\nX-Evil: 1\r\n\r\n", "nul\0after", "\u202ereversed\u2066", "\u2028\u2029\x85",
@@ -413,28 +417,3 @@ class KeptConnections(HTTPSTest):
                 self.assertTrue(ClosingCollector.closed.acquire(timeout=20))
             client.close()
         self.assertEqual(self.counts()["event posted"], 6)
-
-
-class Order(HTTPSTest):
-    def test_posts_arrive_in_order_but_wait_for_no_slow_collector(self):
-        self.serve(entry(realtime_post_url="${url}/events/phone"))
-        with self.serving():
-            client = self.client(batchEvent=True)
-            for delay, in_order in ((60, True), (5000, False)):
-                self.lab.control(path="/events/phone", times=1, delayMs=delay)
-                before = self.posts("phone")
-                client.message(number=delay)
-                client.message(number=delay + 1, flag=1)
-                batch, alone = [post for post in self.posts("phone", len(before) + 2) if post not in before]
-                if alone["body"]["events"][0].get("number") != delay + 1:  # which came is said when it was answered
-                    batch, alone = alone, batch
-                apart = alone["time"] - batch["time"]
-                self.assertTrue(0.06 <= apart if in_order else 0.09 <= apart < 4, apart)
-            self.lab.reset()
-            client.close()
-
-    def test_the_limit_counts_by_the_event_s_own_method(self):
-        self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
-        with self.serving():
-            client = self.client(batchEvent=True)
-            self.assertEqual([client.message(category) is None for category in (5, 6, 7)], [True, True, False])

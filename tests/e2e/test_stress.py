@@ -8,7 +8,7 @@ import sys
 import time
 
 from harness import BUILD, Root, Wire, wait_until
-from test_https import NAMES, HTTPSTest, entry
+from test_https import HTTPSTest, entry
 
 SECONDS = float(os.environ.get("VELTRA_STRESS_SECONDS", "3"))
 CLIENTS, SESSIONS = 4, 60  # processes, and what each holds open at most
@@ -33,8 +33,7 @@ class Crowd:
 
     def join(self, _):
         wire = Wire(self.root)
-        self.answered(wire, NAMES, sessionInfo=self.info(), userInfo=self.identity(), frameworksToCheck=[],
-                      hasAggregationBlock=self.random.random() < 0.4)
+        wire.describe(aggregates=self.random.random() < 0.4, user_info=self.identity(), **self.info())
         assert "backends" in self.answered(wire, "startConfigWithCompletionHandler:"), "no back ends"
         self.sessions.append(wire)
 
