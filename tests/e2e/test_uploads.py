@@ -272,13 +272,12 @@ class Uploads(SystemTest):
             self.assertLessEqual(set(served.asked[asked:]), {FLUSH})
             served.silent = ()
             os.close(hanging)
+            self.lab.control(path="/upload", times=2, body="stored")
             for name in ("small", "large"):
-                self.assertIn("Uploaded and removed", self.upload(os.fsencode(place / name))[1])
-            self.assertEqual(list(served.nodes), [b"hangs"])
-            path = self.make()
-            subprocess.run(["unshare", "-m", *self.UPLOAD, path], env=self.root.environment(), check=True,
+                self.assertIn("has not confirmed it", self.upload(os.fsencode(place / name))[1])
+            subprocess.run(["unshare", "-m", *self.UPLOAD, self.make()], env=self.root.environment(), check=True,
                            capture_output=True)
             digests = [line["plainSHA256"] for line in self.lab.received("uploads", 3)]
         self.assertEqual(digests[:2], [hashlib.sha256(content).hexdigest() for content in (b"served", bytes(9 << 20))])
-        self.assertEqual(self.fates(), {"file refused: others serve its file system": 4, "file uploaded": 3,
-                                        "file confirmed: its removal was asked for": 3})
+        self.assertEqual(self.fates(), {"file refused: others serve its file system": 4, "file not confirmed": 2,
+                                        "file uploaded": 1, "file confirmed: its removal was asked for": 1})
