@@ -147,11 +147,10 @@ class Root:
 class Lab:
     _keys = None  # made once a test process; later labs start with a copy
 
-    def __init__(self, *arguments, own_certificate=False):
+    def __init__(self, *arguments):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-lab-"))
         if Lab._keys:
-            ignored = shutil.ignore_patterns("certificate*") if own_certificate else None
-            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True, ignore=ignored)
+            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True)
         command = [program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments]
         self.process = Process(command, None, "stdout")
         try:
