@@ -203,9 +203,6 @@ class Lab:
             raise AssertionError(f"{len(lines)} of {count} {kind} came within {deadline} s: {lines}")
         return [json.loads(line) for line in lines]
 
-    def storebags(self, count=0):
-        return self.received("storebags", count)
-
     def events(self):
         return [event for post in self.received("events") for event in post["body"]["events"]]
 
@@ -305,7 +302,7 @@ class Wire:
         self.socket = socket.socket(socket.AF_UNIX)
         self.socket.connect(root.socket)  # waits where the queue is full
         self.socket.settimeout(DEADLINE)
-        self._call, self._bytes = 0, b""
+        self._stream, self._call = self.socket.makefile("rb"), 0
         if hello:
             self.send(self.HELLO, {"wire": 1, "library": "8.0"})
             kind, _, body = self.frame()
@@ -321,30 +318,24 @@ class Wire:
             data = data[sent:]
         self.socket.sendall(data)
 
-    def _take(self, length):
-        while len(self._bytes) < length:
-            piece = self.socket.recv(1 << 16)
-            if not piece:
-                return None
-            self._bytes += piece
-        taken, self._bytes = self._bytes[:length], self._bytes[length:]
-        return taken
-
     def frame(self):
         """(kind, call id, body), or nothing when the daemon has ended the connection."""
         try:
-            head = self._take(12)
-            if head is None:
+            head = self._stream.read(12)
+            if len(head) < 12:
                 return None
             length, kind, _, _, call = struct.unpack(">IBBHI", head)
-            return kind, call, plistlib.loads(self._take(length))
+            return kind, call, plistlib.loads(self._stream.read(length))
         except ConnectionResetError:
             return None
 
-    def call(self, op, body=None, **args):
-        """The reply's body, events passed over."""
+    def begin(self, op, **args):
         self._call += 1
-        self.send(self.CALL, {"op": op, "args": args} if body is None else body, self._call)
+        self.send(self.CALL, {"op": op, "args": args}, self._call)
+
+    def call(self, op, **args):
+        """The reply's body, events passed over."""
+        self.begin(op, **args)
         while frame := self.frame():
             if frame[0] == self.REPLY and frame[1] == self._call:
                 return frame[2]
@@ -357,6 +348,7 @@ class Wire:
             userInfo={"clientName": "phone", "serviceName": "ringer", **user_info}, frameworksToCheck=[])
 
     def close(self):
+        self._stream.close()
         self.socket.close()
 
 

@@ -41,10 +41,6 @@ class Client(Wire):
         assert (kind, call) == (self.REPLY, self._call), (kind, call, body)
         return body["results"]
 
-    def begin(self, op, **args):
-        self._call += 1
-        self.send(self.CALL, {"op": op, "args": args}, self._call)
-
     def ask(self, op, **args):
         self.begin(op, **args)
         return self.expect()

@@ -58,7 +58,7 @@ class Shortage(SystemTest):
             self.limit(daemon, 0)
             for _ in range(2):
                 self.assertNotIn("httppost", client.call(START)["results"].get("backends", []))
-            self.assertEqual(self.lab.storebags(), [])
+            self.assertEqual(self.lab.received("storebags"), [])
             self.limit(daemon)
             self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
             client.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"after": True})

@@ -103,8 +103,7 @@ class Stress(HTTPSTest):
                 wait_until(lambda: daemon.status("VmRSS") <= memory + (12 << 10), "memory near its start")
 
     def killed(self, client):
-        if client.poll() is None:
-            client.send_signal(signal.SIGKILL)
+        client.kill()
         self.assertEqual(client.wait(), -signal.SIGKILL, client.stderr.read().decode())
         client.stderr.close()
 
