@@ -125,9 +125,9 @@ class Entries(HTTPSTest):
         ({"filters": {"key": "x"}}, "the client entry has no filters", "filters are"),
         ({"sampling_threshold": "1"}, "the client entry has no sampling threshold", "state=1"),
         ({"client": 7, "service": "{NAME}"}, "reports", "state=2"),
-        ({"service": ["x"], "device_whitelist": "Oak", "device_blacklist": [7, ["Elm"]], "override_sampling": [-1],
-          "per_country_sampling_thresholds": [{"country": "US", "threshold": -2}], "event_threshold": "0",
-          "expedite": "1", "override_dnu": "1", "filters": [7, {"key": ["x"]}]}, "reports", "state=2"),
+        ({"sampling_threshold": -1, "override_sampling": "-1"}, "held", "state=3"),
+        ({"service": ["x"], "device_whitelist": "Oak", "device_blacklist": "Elm", "override_dnu": "1",
+          "per_country_sampling_thresholds": [{"country": "US", "threshold": -2}]}, "reports", "state=2"),
     ], (True, "de_CH.UTF-8"): [
         ({"locale_whitelist": ["CH"], "sampling_threshold": None, "per_country_sampling_thresholds": [
             {"country": ["CH"], "threshold": 1}]}, "reports", "threshold for CH changed from 0.00 to 1.00"),
