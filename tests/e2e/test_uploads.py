@@ -7,6 +7,7 @@ import socket
 import subprocess
 import sys
 import unittest
+from contextlib import closing
 
 from harness import BUILD, DEVICE, SystemTest, Wire, program, storebag, wait_until
 from served import FLUSH, GETATTR, READ, Served
@@ -240,8 +241,7 @@ class Uploads(SystemTest):
         place = self.root.path / "served"
         place.mkdir()
         served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})
-        with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon:
-            self.addCleanup(served.end)  # before the daemon is killed, which may wait for it
+        with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon, closing(served):
             client = self.started()
             hanging = os.open(place / "hangs", os.O_RDONLY)
             served.silent, asked = (READ, GETATTR), len(served.asked)
