@@ -47,7 +47,7 @@ class Process:
     def __init__(self, arguments, env, stream="stderr", **options):
         options.setdefault(stream, subprocess.PIPE)
         options.setdefault("start_new_session", True)  # a Ctrl-C is ours; it ends them in order
-        self.lines, self._news = [], threading.Condition()
+        self.text, self._ended, self._news = [], False, threading.Condition()
         self.popen = subprocess.Popen(arguments, env=env, **options)
         self._stream = getattr(self.popen, stream)
         self._reader = threading.Thread(target=self._read, daemon=True)
@@ -56,27 +56,20 @@ class Process:
     def _read(self):
         for line in self._stream:
             with self._news:
-                self.lines.append(line.decode("utf-8", "replace").rstrip("\n"))
+                self.text.append(line.decode("utf-8", "replace").rstrip("\n"))
                 self._news.notify_all()
         with self._news:
-            self.lines.append(None)  # the end
+            self._ended = True
             self._news.notify_all()
-
-    @property
-    def text(self):
-        with self._news:
-            return [line for line in self.lines if line is not None]
 
     def wait_for(self, condition, what, deadline=DEADLINE):
         """The first true value of condition(lines)."""
         with self._news:
-            def found():
-                return condition([line for line in self.lines if line is not None])
-            self._news.wait_for(lambda: found() or None in self.lines, deadline)
-            if value := found():
+            self._news.wait_for(lambda: condition(self.text) or self._ended, deadline)
+            if value := condition(self.text):
                 return value
             raise AssertionError(f"{what}: not within {deadline} s, or the process ended; its last lines:\n" +
-                                 "\n".join(line for line in self.lines[-40:] if line))
+                                 "\n".join(self.text[-40:]))
 
     def end(self, deadline=DEADLINE):
         """Waits for the exit; the status."""
@@ -89,6 +82,19 @@ class Process:
         self._reader.join(deadline)
         self._stream.close()
         return status
+
+    def descriptors(self):
+        """What each leads to, but for the message log, which is opened when its first line is written."""
+        names = []
+        for link in pathlib.Path(f"/proc/{self.popen.pid}/fd").iterdir():
+            with contextlib.suppress(FileNotFoundError):  # closed meanwhile
+                names.append(os.readlink(link))
+        return sorted(name for name in names if not name.endswith("messageLog.diag"))
+
+    def status(self, key):
+        """A number of /proc/PID/status; sizes in KiB."""
+        lines = pathlib.Path(f"/proc/{self.popen.pid}/status").read_text().splitlines()
+        return int(next(line.split()[1] for line in lines if line.startswith(key + ":")))
 
     def kill(self):
         if self.popen.poll() is None:
@@ -141,11 +147,10 @@ class Root:
 class Lab:
     _keys = None  # made once a test process; later labs start with a copy
 
-    def __init__(self, *arguments, own_certificate=False):
+    def __init__(self, *arguments):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-lab-"))
         if Lab._keys:
-            ignored = shutil.ignore_patterns("certificate*") if own_certificate else None
-            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True, ignore=ignored)
+            shutil.copytree(Lab._keys, self.path, dirs_exist_ok=True)
         command = [program("veltra-lab"), "--dir", str(self.path), "--port", "0", *arguments]
         self.process = Process(command, None, "stdout")
         try:
@@ -197,9 +202,6 @@ class Lab:
         if len(lines) < count:
             raise AssertionError(f"{len(lines)} of {count} {kind} came within {deadline} s: {lines}")
         return [json.loads(line) for line in lines]
-
-    def storebags(self, count=0):
-        return self.received("storebags", count)
 
     def events(self):
         return [event for post in self.received("events") for event in post["body"]["events"]]
@@ -300,7 +302,7 @@ class Wire:
         self.socket = socket.socket(socket.AF_UNIX)
         self.socket.connect(root.socket)  # waits where the queue is full
         self.socket.settimeout(DEADLINE)
-        self._call, self._bytes = 0, b""
+        self._stream, self._call = self.socket.makefile("rb"), 0
         if hello:
             self.send(self.HELLO, {"wire": 1, "library": "8.0"})
             kind, _, body = self.frame()
@@ -316,42 +318,37 @@ class Wire:
             data = data[sent:]
         self.socket.sendall(data)
 
-    def _take(self, length):
-        while len(self._bytes) < length:
-            piece = self.socket.recv(1 << 16)
-            if not piece:
-                return None
-            self._bytes += piece
-        taken, self._bytes = self._bytes[:length], self._bytes[length:]
-        return taken
-
     def frame(self):
         """(kind, call id, body), or nothing when the daemon has ended the connection."""
         try:
-            head = self._take(12)
-            if head is None:
+            head = self._stream.read(12)
+            if len(head) < 12:
                 return None
             length, kind, _, _, call = struct.unpack(">IBBHI", head)
-            return kind, call, plistlib.loads(self._take(length))
+            return kind, call, plistlib.loads(self._stream.read(length))
         except ConnectionResetError:
             return None
 
-    def call(self, op, body=None, **args):
-        """The reply's body, events passed over."""
+    def begin(self, op, **args):
         self._call += 1
-        self.send(self.CALL, {"op": op, "args": args} if body is None else body, self._call)
+        self.send(self.CALL, {"op": op, "args": args}, self._call)
+
+    def call(self, op, **args):
+        """The reply's body, events passed over."""
+        self.begin(op, **args)
         while frame := self.frame():
             if frame[0] == self.REPLY and frame[1] == self._call:
                 return frame[2]
         return None
 
-    def describe(self, client_type=7, aggregates=False):
-        return self.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:",
-                         hasAggregationBlock=aggregates,
-                         sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True},
-                         userInfo={"clientName": "phone", "serviceName": "ringer"}, frameworksToCheck=[])
+    def describe(self, client_type=7, aggregates=False, user_info={}, **session_info):
+        return self.call(
+            "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=aggregates,
+            sessionInfo={"clientType": client_type, "sessionID": 9, "requireUserInfo": True, **session_info},
+            userInfo={"clientName": "phone", "serviceName": "ringer", **user_info}, frameworksToCheck=[])
 
     def close(self):
+        self._stream.close()
         self.socket.close()
 
 
@@ -407,6 +404,10 @@ class SystemTest(unittest.TestCase):
         answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]
+
+    def counts(self):
+        """What the daemon that has ended counted."""
+        return json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
 
     def ctl(self, *arguments, input="", status=0, root=None):
         """Runs veltractl to its end; its answers, and what it said on standard error."""

@@ -1,30 +1,27 @@
 """A file system that this process serves, in the kernel's own protocol (FUSE, linux/fuse.h): regular files whose
 requests can be left without an answer."""
+import contextlib
 import ctypes
 import os
 import struct
 import threading
 
 LIBC = ctypes.CDLL(None, use_errno=True)
-LOOKUP, FORGET, GETATTR, UNLINK, RENAME, OPEN, READ, RELEASE, FLUSH, INIT = 1, 2, 3, 10, 12, 14, 15, 18, 25, 26
+LOOKUP, FORGET, GETATTR, OPEN, READ, RELEASE, FLUSH, INIT = 1, 2, 3, 14, 15, 18, 25, 26
 ENOENT, ENOSYS = 2, 38
 
 
 class Served:
     """Mounted at `place`, which needs the right to mount. `silent`: the requests that get no answer."""
 
-    def __init__(self, place, files, silent=()):
-        self.place, self.silent, self.asked = os.fsencode(place), silent, []
-        self.contents = list(files.values())
-        self.nodes = {os.fsencode(name): node for node, name in enumerate(files, 2)}
+    def __init__(self, place, files):
+        self.place, self.silent, self.asked = os.fsencode(place), (), []
+        self.names, self.contents = [os.fsencode(name) for name in files], list(files.values())
         self.device = os.open("/dev/fuse", os.O_RDWR)
         options = f"fd={self.device},rootmode=40000,user_id={os.getuid()},group_id=0,allow_other"
         if LIBC.mount(b"served", self.place, b"fuse.served", 6, options.encode()) != 0:
-            error = ctypes.get_errno()
-            os.close(self.device)
-            raise OSError(error, "mount")
-        self.thread = threading.Thread(target=self.serve, daemon=True)
-        self.thread.start()
+            raise OSError(ctypes.get_errno(), "mount")
+        threading.Thread(target=self.serve, daemon=True).start()
 
     def serve(self):
         while True:
@@ -34,13 +31,10 @@ class Served:
                 return
             _, code, unique, node = struct.unpack_from("<IIQQ", request)
             self.asked.append(code)
-            if code in self.silent or code == FORGET:
-                continue
-            error, body = self.answer(code, node, request[40:])
-            try:
-                os.write(self.device, struct.pack("<IiQ", 16 + len(body), -error, unique) + body)
-            except OSError:  # nobody waits for it any more
-                return
+            if code not in self.silent and code != FORGET:
+                error, body = self.answer(code, node, request[40:])
+                with contextlib.suppress(OSError):  # nobody waits for it any more
+                    os.write(self.device, struct.pack("<IiQ", 16 + len(body), -error, unique) + body)
 
     def attributes(self, node):
         mode, size = (0o40755, 0) if node == 1 else (0o100644, len(self.contents[node - 2]))
@@ -49,18 +43,9 @@ class Served:
     def answer(self, code, node, body):
         if code == INIT:
             return 0, struct.pack("<IIIIHHIIHHI28x", 7, 31, 65536, 0, 12, 10, 65536, 1, 16, 0, 0)
-        if code in (LOOKUP, UNLINK):
-            found = self.nodes.get(name := body[:-1])
-            if not found:
-                return ENOENT, b""
-            if code == UNLINK:
-                del self.nodes[name]
-                return 0, b""
+        if code == LOOKUP and body[:-1] in self.names:
+            found = self.names.index(body[:-1]) + 2
             return 0, struct.pack("<QQQQII", found, 0, 0, 0, 0, 0) + self.attributes(found)
-        if code == RENAME:
-            old, new, _ = body[8:].split(b"\0")
-            self.nodes[new] = self.nodes.pop(old)
-            return 0, b""
         if code == GETATTR:
             return 0, struct.pack("<QII", 0, 0, 0) + self.attributes(node)
         if code == OPEN:
@@ -68,9 +53,9 @@ class Served:
         if code == READ:
             _, offset, size = struct.unpack_from("<QQI", body)
             return 0, self.contents[node - 2][offset:offset + size]
-        return (0, b"") if code in (RELEASE, FLUSH) else (ENOSYS, b"")
+        return {RELEASE: 0, FLUSH: 0, LOOKUP: ENOENT}.get(code, ENOSYS), b""
 
-    def end(self):
-        """What waits for an answer gets an error."""
+    def close(self):
+        """By force: what waits gets an error. Before the daemon is killed, whose end would wait for an answer, too."""
+        LIBC.umount2(self.place, 1 | 2)
         os.close(self.device)
-        LIBC.umount2(self.place, 2)

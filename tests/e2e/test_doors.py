@@ -2,6 +2,7 @@
 import contextlib
 import multiprocessing
 import os
+import re
 import signal
 import socket
 import sys
@@ -14,8 +15,7 @@ class Doors(SystemTest):
     def test_entitlement(self):
         own = {"uid": os.getuid(), "entitlements": {ENTITLEMENT: True}}
         refused = [[{**own, "uid": os.getuid() + 1}], [{**own, "entitlements": {ENTITLEMENT: 1}}],
-                   [{**own, "entitlements": {ENTITLEMENT: False}}],
-                   [{**own, "entitlements": {ENTITLEMENT: "true"}}], [{"entitlements": {ENTITLEMENT: True}}], []]
+                   [{**own, "entitlements": {ENTITLEMENT: False}}], []]
         with self.serving("Entitlements") as daemon:
             for count, rules in enumerate(refused + [None, b"<plist"], 1):
                 with self.subTest(rules=rules):
@@ -37,23 +37,15 @@ class Doors(SystemTest):
 
     def test_lines_of_a_connection(self):
         with self.serving() as daemon:
-            first, second = Wire(self.root), Wire(self.root)
-            accepted = daemon.wait_for_line("listener: Accepting new Vopex connection", 2)
-            self.assertRegex(accepted, r"^<7>listener: Accepting new Vopex connection \S.* as it has proper "
-                                       r"entitlement, 1\(0\) connections\.$")
-            first.send(Wire.CALL, b"no property list", call=7)
-            kind, call, body = first.frame()
-            self.assertEqual((kind, call), (Wire.REPLY, 7))
-            self.assertTrue(body["error"]["description"])
-            interrupted = daemon.wait_for_line("was interrupted")
-            self.assertRegex(interrupted, r"^<7>listener: Vopex connection to \S.* was interrupted$")
-            self.assertEqual(first.call("fetchDisplayURL:")["results"]["reply"], "URL not available")
-            first.close()
-            invalidated = daemon.wait_for_line("was invalidated")
-            self.assertEqual(invalidated, interrupted.replace("interrupted", "invalidated"))
-            second.close()
-            daemon.wait_for_line("was invalidated", 2)
-            daemon.wait_for_line("<7>dealloc: VeltradSession dealloc: 0", 2)
+            client = Wire(self.root)
+            client.send(Wire.CALL, b"no property list", call=7)
+            client.frame()
+            client.close()
+            for line in ("listener: Accepting new Vopex connection .+ as it has proper entitlement, 0(0) connections.",
+                         "listener: Vopex connection to .+ was interrupted",
+                         "listener: Vopex connection to .+ was invalidated", "dealloc: VeltradSession dealloc: 0"):
+                pattern = "<7>" + re.escape(line).replace(re.escape(".+"), ".+")
+                daemon.wait_for(lambda said: any(re.fullmatch(pattern, one) for one in said), line)
 
     def refused(self, root, words, **options):
         """A daemon that does not start: status 1 and one error line with the words."""
@@ -141,9 +133,8 @@ class Crowd(SystemTest):
                 for one in crowd:
                     one.kill()
                     one.join()
-            late = sorted(waits)[-3]
             # 0.1 s on a machine of its own; here other tests run beside it.
-            self.assertLess(late, 0.1 if BUILD.name == "release" else 0.3, "seconds to a greeting at the 99th percentile")
+            self.assertLess(sorted(waits)[-3], 0.1 if BUILD.name == "release" else 0.3, "seconds to a greeting at the 99th percentile")
 
 
 class Stop(SystemTest):
@@ -174,6 +165,6 @@ class Stop(SystemTest):
         daemon = self.daemon()
         for client_type in (6, 7):  # "quindle" has a default, which is not for a stop
             self.addCleanup(Ctl(self.root, client_type).kill)
-        self.lab.storebags(2)
+        self.lab.received("storebags", 2)
         self.assertLess(daemon.stop(), 5)
         self.assertFalse([line for line in daemon.text if "Loading default storebag" in line])

@@ -6,17 +6,13 @@ import hashlib
 import http.server
 import itertools
 import json
-import os
-import pathlib
 import plistlib
 import re
-import shutil
 import ssl
 import threading
 
-from harness import BUILD, Lab, SystemTest, Wire, closed_port, storebag, wait_until
+from harness import SystemTest, Wire, closed_port, storebag, wait_until
 
-NAMES = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 LOGS = "var/mobile/Library/Logs/Zentrel/Retired"
 COUNTRY = "the country is not in locale_whitelist"
 POST_ERROR = "<3>HTTPSPostBackend(postJsonMessage): post error: "
@@ -36,19 +32,14 @@ class Client(Wire):
     def __init__(self, root, name="phone", client_type=7, user_info={}, aggregates=False, **session_info):
         super().__init__(root)
         self.number = next(self.numbers)
-        self.ask(NAMES, frameworksToCheck=[], hasAggregationBlock=aggregates,
-                 sessionInfo={"clientType": client_type, "sessionID": self.number, "requireUserInfo": True,
-                              **session_info}, userInfo={"clientName": name, "serviceName": name, **user_info})
+        self.describe(client_type, aggregates, {"clientName": name, "serviceName": name, **user_info},
+                      sessionID=self.number, **session_info)
         self.backends = self.start()
 
     def expect(self):
         kind, call, body = self.frame()
         assert (kind, call) == (self.REPLY, self._call), (kind, call, body)
         return body["results"]
-
-    def begin(self, op, **args):
-        self._call += 1
-        self.send(self.CALL, {"op": op, "args": args}, self._call)
 
     def ask(self, op, **args):
         self.begin(op, **args)
@@ -107,10 +98,6 @@ class HTTPSTest(SystemTest):
         written = (self.root.path / "run/veltrad/counters.json").exists()
         return json.loads(self.ctl("stats", "--json")[0])["counts"] if written else {}
 
-    def counts(self):
-        """Once the daemon has ended."""
-        return json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
-
 
 class Entries(HTTPSTest):
     # By consent and LANG: the entry's changes, reports / held / why it is disabled, a part of the line that says it.
@@ -133,6 +120,14 @@ class Entries(HTTPSTest):
         ({"client": "desk,{NAME}"}, "reports", "state=2"), ({"client": "desk, {NAME}"}, "no client entry fits", ""),
         ({"service": "lamp,{NAME}"}, "reports", "state=2"), ({"service": "{NAME}x"}, "no client entry fits", ""),
         ({"override_dnu": 1}, "reports", "state=2"),
+        # A value of a wrong type is as if it were absent.
+        ({"locale_whitelist": "US"}, COUNTRY, "(US) isn't in country code list"),
+        ({"filters": {"key": "x"}}, "the client entry has no filters", "filters are"),
+        ({"sampling_threshold": "1"}, "the client entry has no sampling threshold", "state=1"),
+        ({"client": 7, "service": "{NAME}"}, "reports", "state=2"),
+        ({"sampling_threshold": -1, "override_sampling": "-1"}, "held", "state=3"),
+        ({"service": ["x"], "device_whitelist": "Oak", "device_blacklist": "Elm", "override_dnu": "1",
+          "per_country_sampling_thresholds": [{"country": "US", "threshold": -2}]}, "reports", "state=2"),
     ], (True, "de_CH.UTF-8"): [
         ({"locale_whitelist": ["CH"], "sampling_threshold": None, "per_country_sampling_thresholds": [
             {"country": ["CH"], "threshold": 1}]}, "reports", "threshold for CH changed from 0.00 to 1.00"),
@@ -144,9 +139,6 @@ class Entries(HTTPSTest):
         ({"override_dnu": 2}, "no consent to diagnostic submission", "reporting disabled by DNU: 2."),
         ({"override_dnu": 1}, "reports", "state=2"),
     ]}
-
-    def names(self):
-        return (f"case{number:03}" for number in itertools.count())
 
     def decide(self, daemon, name, changes, outcome, line, consent):
         client = self.client(name)
@@ -166,7 +158,7 @@ class Entries(HTTPSTest):
                          [(1 + consent) * overridden] if posts else [])
 
     def test_decisions(self):
-        names = self.names()
+        names = (f"case{number:03}" for number in itertools.count())
         cases = [(facts, next(names), *row) for facts, rows in self.DECISIONS.items() for row in rows]
         self.serve(*(entry(name, **{key: value.replace("{NAME}", name) if isinstance(value, str) else value
                                     for key, value in changes.items()}) for _, name, changes, *_ in cases))
@@ -191,55 +183,6 @@ class Entries(HTTPSTest):
         identifier, = {post["body"]["clientId"] for post in self.posts("phone", 4)}
         self.assertEqual(self.preferences()[f"uuid:{name}:ringer"], identifier)
 
-    # Every documented key: values of a wrong type, and what the entry holds besides. Found by the service where the
-    # test is about the client's name.
-    NO_TEXT = (7, True, ["x"], {"x": "y"}, b"x", datetime.datetime(2020, 1, 1))
-    NO_NUMBER = ("1", [1], {"x": 1}, b"1", datetime.datetime(2020, 1, 1))
-    NO_ARRAY = ("US", 1, {"US": 1}, b"US", [7, True, {"US": "US"}, [["US"]], b"US"])
-    WRONG = [
-        ("client", NO_TEXT, {}), ("service", NO_TEXT, {}), ("post_url", NO_TEXT, {}),
-        ("realtime_post_url", NO_TEXT, {}), ("expedite", NO_NUMBER, {}), ("hierarchy", NO_NUMBER, {}),
-        ("override_dnu", NO_NUMBER, {}), ("locale_whitelist", NO_ARRAY, {}), ("device_whitelist", NO_ARRAY, {}),
-        ("device_blacklist", NO_ARRAY, {}), ("filters", NO_ARRAY[:4], {}), ("sampling_threshold", NO_NUMBER, {}),
-        ("per_country_sampling_thresholds", NO_ARRAY, {}),
-        ("override_sampling", NO_NUMBER, {"sampling_threshold": -1}), ("event_threshold", NO_NUMBER, {}),
-        ("extras_on_internal", NO_NUMBER, {}),
-    ]
-    # Dictionaries inside an entry: around the key, the key, values of a wrong type.
-    WRONG_INSIDE = [
-        ("filters", {"action": "remove"}, "key", NO_TEXT),
-        ("filters", {"key": "codec", "action": "remove", "status": 2}, "method", NO_NUMBER),
-        ("filters", {"key": "codec", "action": "remove", "method": 5}, "status", NO_NUMBER),
-        ("filters", {"key": "codec"}, "action", NO_TEXT),
-        ("per_country_sampling_thresholds", {"threshold": -1}, "country", ("US", 7, {"US": "US"}, [7, ["US"]])),
-        ("per_country_sampling_thresholds", {"country": ["US"]}, "threshold", NO_NUMBER),
-    ]
-
-    def outcome(self, daemon, name):
-        """All that tells one entry from another: the names reported, the event, the lines."""
-        client = self.client(name)
-        reply = client.message(codec="opus", flag=1)
-        event = json.loads(reply)["events"][-1] if reply else {}
-        changing = {"_clientTS", "eventTime", "_startTS", "_sessionID", "clientName", "serviceName"}
-        said = [re.sub(r"samplingFactor=[\d.]+| list .*|case\d+|session \d+", "", line)
-                for line in client.mark(daemon) if "Backend" in line]
-        return client.backends, {key: event[key] for key in event.keys() - changing}, said
-
-    def test_wrong_types_are_as_if_absent(self):
-        groups = [({**more, key: None}, [{**more, key: value} for value in values]) for key, values, more in self.WRONG]
-        groups += [({outer: [around]}, [{outer: [{**around, key: value}]} for value in values])
-                   for outer, around, key, values in self.WRONG_INSIDE]
-        names = self.names()
-        named = [(next(names), absent, [(next(names), wrong) for wrong in wrongs]) for absent, wrongs in groups]
-        self.serve(*(entry(name, **{**({"service": name} if "client" in changes else {}), **changes})
-                     for first, absent, wrongs in named for name, changes in [(first, absent), *wrongs]))
-        with self.serving("filters are required.") as daemon:
-            for first, absent, wrongs in named:
-                expected = self.outcome(daemon, first)
-                for name, wrong in wrongs:
-                    with self.subTest(wrong, absent=absent):
-                        self.assertEqual(self.outcome(daemon, name), expected)
-
     def test_wrong_sections(self):
         for client_type, name, section, backends in (
                 (5, "pellmarch", {"clients": {"client": "phone"}}, []), (6, "ostvane", "clients", []),
@@ -250,21 +193,6 @@ class Entries(HTTPSTest):
                 client = self.client(client_type=client_type)
                 self.assertEqual(client.backends, backends)
                 self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "URL not available")
-
-    def test_thousand_entries_and_filters(self):
-        actions = ("remove", "sha256", "keep")
-        filters = [{"key": f"field{n}", "action": actions[n % 3], "method": 5} for n in range(1000)]
-        self.serve(*(entry(f"client{n:03}") for n in range(999)), entry("phone", filters=filters))
-        with self.serving() as daemon:
-            client = self.client()
-            # The processor's seconds, which a busy machine does not stretch; sanitizers do.
-            fields = pathlib.Path(f"/proc/{daemon.popen.pid}/stat").read_text().rsplit(")", 1)[1].split()
-            seconds = sum(map(int, fields[11:13])) / os.sysconf("SC_CLK_TCK")
-            self.assertLess(seconds, 1 if BUILD.name in ("dev", "release") else 10)
-            event = client.event(**{f"field{n}": "x" for n in range(0, 1000, 10)})
-        kept = {key: value for key, value in event.items() if key.startswith("field")}
-        self.assertEqual({key: len(value) for key, value in kept.items()},
-                         {f"field{n}": 64 if n % 3 == 1 else 1 for n in range(0, 1000, 10) if n % 3})
 
 
 class Events(HTTPSTest):
@@ -332,88 +260,54 @@ class Events(HTTPSTest):
                                 [None, secret, opus, one, None, 1]])
         self.assertNotIn('"secret"', json.dumps(post))
 
+    def test_the_limit_counts_by_the_event_s_own_method(self):
+        self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
+        with self.serving():
+            client = self.client(batchEvent=True)
+            self.assertEqual([client.message(category) is None for category in (5, 6, 7)], [True, True, False])
+
 
 class Hostile(HTTPSTest):
     TEXTS = ['"quoted\\"', "line\r\nX-Evil: 1\r\n\r\n", "nul\0after", "\u202ereversed\u2066", "\u2028\u2029\x85",
-             "\x1b[31mred\x7f", "ünïcödé 🦉", "x" * (200 << 10), "%s%n%@", ""]
+             "\x1b[31mred\x7f", "ünïcödé 🦉", "%s%n%@", "x" * (200 << 10)]
 
     def test_texts_break_nothing(self):
-        self.serve(entry(client=None, custom_clientId=1))
+        self.serve(entry(client=None))
         payload = {f"key{n} {text[:30]}": text for n, text in enumerate(self.TEXTS)}
-        payload.update(at=datetime.datetime(2014, 11, 16, 20, 13, 54), list=[["a\nb"]], more={"a\n": "b"}, raw=b"\0",
-                       nan=float("nan"))
-        with self.serving("Quillfen unable to handle key: ") as daemon:
-            for name in (text for text in self.TEXTS if len(text) < 1000):
-                client = self.client(name, user_info={"service\nName": name, "serviceName": name[::-1]})
-                event = client.event(**payload)
-                for key, text in payload.items():
-                    if isinstance(text, str):
-                        self.assertEqual(event[key], text, key[:50])
-                self.assertEqual([event[key] for key in ("at", "clientName", "serviceName")],
-                                 [1416168834, name, name[::-1]])
-                self.assertFalse({"list", "more", "raw", "nan"} & set(event))
-                client.message(9, 9, **{"list\n<3>faked": [1], "x" * 9000: [["y" * 9000]]})
+        removed = {"list": [["a\nb"]], "more": {"a\n": "b"}, "raw": b"\0", "nan": float("nan"), "\n<3>faked": [1]}
+        with self.serving("Quillfen unable to handle key: "):
+            for name in self.TEXTS[:-1]:
+                client = self.client(name, user_info={"serviceName": name[::-1]})
+                event = client.event(**payload, **removed, at=datetime.datetime(2014, 11, 16, 20, 13, 54))
+                expected = {**payload, "at": 1416168834, "clientName": name, "serviceName": name[::-1]}
+                self.assertEqual({key: event[key] for key in expected}, expected)
+                self.assertFalse(removed.keys() & event.keys())
                 client.close()
-            posts = self.posts("phone", 4 * (len(self.TEXTS) - 1))
-            daemon.wait_for_line("Quillfen unable to handle key: list\\x0A<3>faked, value: [1]", len(self.TEXTS) - 1)
-            self.assertRegex(daemon.wait_for_line("key: xx"), r"x… \(7976 bytes cut\), value: \[\[\"y+… \(7982 bytes cut\)$")
+            posts = self.posts("phone", 3 * len(self.TEXTS[:-1]))
         for post in posts:
             self.assertNotIn("X-Evil", post["headers"])
             name = post["body"]["events"][0]["clientName"]
             sent = "".join(c for c in name if c >= " " and c != "\x7f").strip(" ")
-            self.assertEqual(post["headers"].get("X-VLT-Client-Name", ""), sent)
-        self.assertEqual(self.counts()["event field removed: JSON cannot carry it"], 6 * (len(self.TEXTS) - 1))
-        self.assertEqual(len({post["body"]["clientId"] for post in posts}), len(self.TEXTS) - 1)
-        for log in (self.root.path / LOGS).iterdir():
-            entries = [line for line in log.read_text().split("\n") if "[httppost -> " in line]
-            self.assertEqual(len(entries), len(posts))
+            self.assertEqual(post["headers"]["X-VLT-Client-Name"], sent)
+        self.assertEqual(self.counts()["event field removed: JSON cannot carry it"], 5 * len(self.TEXTS[:-1]))
 
 
 class MessageLog(HTTPSTest):
-    def wait_for_lines(self, *operations):
-        """Of exactly these entries; they are written soon after the reply."""
-        wait_until(lambda: self.lines() == list(operations), operations)
-
-    def lines(self):
-        """The operation of each entry."""
-        files = list((self.root.path / LOGS).iterdir()) if (self.root.path / LOGS).exists() else []
-        if not files:
-            return []
-        self.assertEqual(len(files), 1)
-        self.assertRegex(files[0].name, r"^veltrad_\d+_messageLog\.diag$")
-        date = r"\d{4}-\d\d-\d\d \d\d:\d\d:\d\d \+0000"
-        return re.findall(rf"^\({date}\) \[httppost -> (\w+)\] \{{$", files[0].read_text(), re.M)
-
-    def test_a_line_for_each_answer(self):
-        self.serve(entry())
-        failed = [f"writeToLogFile: {what} " for what in ("Error reading from log directory:", "Failed to create new")]
-        with self.serving(*failed) as daemon:
-            client = self.client(batchEvent=True)
-            client.message()
-            self.assertFalse((self.root.path / LOGS).exists())
-            client.flush()
-            client.message(flag=1)
-            self.wait_for_lines("flushMessages", "sendMessageWithDictionary")
-            shutil.rmtree(self.root.path / LOGS)
-            (self.root.path / LOGS).write_text("in the way")
-            self.assertEqual(client.event(flag=1)["_method"], 5)
-            for line in failed:
-                daemon.wait_for_line("<3>" + line)
-            (self.root.path / LOGS).unlink()
-            client.message(flag=1)
-            self.wait_for_lines("sendMessageWithDictionary")
-            client.close()
-            self.posts("phone", 5)
-
-    def test_nothing_without_consent(self):
-        self.root.prefer(DiagnosticLogSubmissionEnabled=False)
-        self.serve(entry(override_dnu=1))
-        with self.serving():
-            client = self.client()
-            self.assertEqual((client.message(), client.flush()), (None, (None, -1, "Nothing to flush")))
-            client.close()
-            self.posts("phone", 3)
-        self.assertFalse((self.root.path / LOGS).exists())
+    def test_a_line_for_each_answer_and_none_without_consent(self):
+        for consent in (True, False):
+            self.serve(entry(override_dnu=int(not consent)))
+            self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
+            with self.serving():
+                client = self.client(batchEvent=True)
+                client.message()
+                self.assertEqual((client.flush()[0] is not None, client.message(flag=1) is not None), (consent, consent))
+                client.close()
+                self.posts("phone", 3)
+            file, = (self.root.path / LOGS).iterdir()
+            self.assertRegex(file.name, r"^veltrad_\d+_messageLog\.diag$")
+            date = r"\d{4}-\d\d-\d\d \d\d:\d\d:\d\d \+0000"
+            self.assertEqual(re.findall(rf"^\({date}\) \[httppost -> (\w+)\] \{{$", file.read_text(), re.M),
+                             ["flushMessages", "sendMessageWithDictionary", "flushMessages"])
 
 
 class Moods(HTTPSTest):
@@ -430,8 +324,7 @@ class Moods(HTTPSTest):
         ("halfway", {"cutHalfway": True, "body": "xxxx"}, (-1, "transfer closed with 2 bytes remaining to read"), 1),
         ("endless", {"endless": True}, (None, None), 1),  # nobody reads it: the status counts
         ("refused", {}, (-1, "Failed to connect to localhost port "), 0),
-        ("nowhere", {}, (-1, "Could not resolve host: collector.invalid"), 0),
-        ("stranger", {}, (-1, "SSL certificate problem: self-signed certificate"), 0)]
+        ("nowhere", {}, (-1, "Could not resolve host: collector.invalid"), 0)]
 
     def flush_in_a_mood(self, daemon, name, rule, expected, arrived):
         client = self.client(name, batchEvent=True)
@@ -454,10 +347,7 @@ class Moods(HTTPSTest):
         client.close()
 
     def test_each_flush_is_answered_once(self):
-        stranger = Lab(own_certificate=True)
-        self.addCleanup(stranger.stop)
-        urls = {**self.URLS, "stranger": stranger.url + "/events"}
-        self.serve(*(entry(name, **({"post_url": urls[name]} if name in urls else {})) for name, *_ in self.MOODS))
+        self.serve(*(entry(name, post_url=self.URLS.get(name, "${url}/events/" + name)) for name, *_ in self.MOODS))
         with self.serving(POST_ERROR) as daemon:
             for mood in self.MOODS:
                 with self.subTest(mood[0]):
@@ -466,25 +356,24 @@ class Moods(HTTPSTest):
             counts = {"event posted": 4 * 2 + 10 * 2, "event lost: the server answered 5xx": 4,
                       "event lost: the server answered 4xx": 2,
                       "event lost: the server answered 3xx, and no post follows a redirect": 2,
-                      "event lost: the post failed": 2 * 2 + 3 * 4, "event held: batched": 13 * 4}
+                      "event lost: the post failed": 2 * 2 + 2 * 4, "event held: batched": 12 * 4}
             wait_until(lambda: counts.items() <= self.stats().items(), counts)
         # One line a second at most; with the last, at the stop, every post that failed has been said.
         lines = [line for line in daemon.text if line.startswith(POST_ERROR)]
         self.assertEqual(lines[0], POST_ERROR + "transfer closed with 2 bytes remaining to read")
         said = (re.search(r" \((\d+) posts since the last such line\)$", line) for line in lines)
-        self.assertEqual(sum(int(more[1]) if more else 1 for more in said), 3 + 3 * 2)
-        self.assertEqual((self.posts("elsewhere"), stranger.received("events")), ([], []))
+        self.assertEqual(sum(int(more[1]) if more else 1 for more in said), 3 + 2 * 2)
+        self.assertEqual(self.posts("elsewhere"), [])
 
 
 class ClosingCollector(http.server.BaseHTTPRequestHandler):
     """Answers one post a connection with 200, does not say that it closes, and closes, as a server does that has waited
     long enough."""
     protocol_version = "HTTP/1.1"
-    heads, closed = [], threading.Semaphore(0)
+    closed = threading.Semaphore(0)
 
     def do_POST(self):
         self.rfile.read(int(self.headers["Content-Length"]))
-        self.heads.append(self.headers.keys())
         self.wfile.write(b"HTTP/1.1 200 OK\r\nContent-Length: 0\r\n\r\n")
         self.close_connection = True
 
@@ -519,43 +408,4 @@ class KeptConnections(HTTPSTest):
                 self.assertEqual(client.flush()[1:], (None, None))
                 self.assertTrue(ClosingCollector.closed.acquire(timeout=20))
             client.close()
-        self.assertEqual((len(ClosingCollector.heads), self.counts()["event posted"]), (5, 6))
-        self.assertEqual([name for name in ClosingCollector.heads[-1] if name != "Host"], [
-            "X-VLT-Client-Name", "X-VLT-Service-Name", "User-Agent", "X-VLT-Client-Version", "X-VLT-Sender", "Accept",
-            "Content-Type", "Content-Length", "Content-Encoding"])
-
-
-class Order(HTTPSTest):
-    def test_posts_arrive_in_order_but_wait_for_no_slow_collector(self):
-        self.serve(entry(realtime_post_url="${url}/events/phone"))
-        with self.serving():
-            client = self.client(batchEvent=True)
-            for delay, in_order in ((60, True), (5000, False)):
-                self.lab.control(path="/events/phone", times=1, delayMs=delay)
-                before = self.posts("phone")
-                client.message(number=delay)
-                client.message(number=delay + 1, flag=1)
-                batch, alone = [post for post in self.posts("phone", len(before) + 2) if post not in before]
-                if alone["body"]["events"][0].get("number") != delay + 1:  # which came is said when it was answered
-                    batch, alone = alone, batch
-                apart = alone["time"] - batch["time"]
-                self.assertTrue(0.06 <= apart if in_order else 0.09 <= apart < 4, apart)
-            self.lab.reset()
-            client.close()
-
-    def test_the_limit_counts_by_the_event_s_own_method(self):
-        self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
-        with self.serving():
-            client = self.client(batchEvent=True)
-            self.assertEqual([client.message(category) is None for category in (5, 6, 7)], [True, True, False])
-
-    def test_a_single_message_names_its_client_by_numbers(self):
-        self.serve(entry())
-        with self.serving("sendMessageWithSessionInfo: "):
-            client = self.client()
-            for info in ({"clientType": 7, "sessionID": "1"}, {"clientType": "7", "sessionID": 1}, {"clientType": 7}):
-                client.begin("sendMessageWithSessionInfo:userInfo:category:type:payload:reply:", sessionInfo=info,
-                             userInfo={"clientName": "phone", "serviceName": "x"}, category=5, type=2, payload={})
-                self.assertIn("gave no reply", str(client.frame()[2]))
-            client.close()
-            self.posts("phone", 2)
+        self.assertEqual(self.counts()["event posted"], 6)

@@ -39,8 +39,7 @@ def message(r):
 @unittest.skipIf(BUILD.name in ("asan", "tsan"), "a sanitizer keeps memory of its own")
 class Memory(SystemTest):
     def resident(self, daemon):
-        status = pathlib.Path(f"/proc/{daemon.popen.pid}/status").read_text()
-        return int(status.split("VmRSS:")[1].split()[0]) * 1024
+        return daemon.status("VmRSS") * 1024
 
     def at_rest(self, daemon):
         """After the first post, and a while without a session."""

@@ -46,19 +46,6 @@ class Posts(HTTPSTest):
             self.posts("mine", 2)
             self.assertEqual(self.posts("other"), [])
 
-    def test_a_batch_without_end_is_bounded(self):
-        self.serve(entry(event_threshold=1 << 30, sampling_threshold=-1))
-        with self.serving():
-            client, most = self.client(batchEvent=True), 4096
-            for _ in range(most + 9):
-                client.send(client.CALL, {"op": "sendMessageWithDictionary:reply:",
-                                          "args": {"message": {"category": 5, "type": 2}}})
-            client.message()
-            client.close()
-        # Of those, and of the start, the answered one and the stop.
-        self.assertEqual(self.counts()["event dropped: the batch is full"], 9 + 3)
-        self.assertEqual(self.lab.events(), [])
-
     def test_internal_builds_of_three_types_report_the_number(self):
         self.root.write("etc/veltrad/device.plist", {**DEVICE, "ReleaseType": "Internal"})
         for name in ("quindle", "crovish", "yarrowin"):

@@ -9,7 +9,7 @@ from harness import IDENTITY, SOURCE, SystemTest, program, wait_until
 class Road(SystemTest):
     def test_event_with_its_headers_and_fields(self):
         self.root.write("usr/share/veltra/package.plist", {"version": "8.2"})
-        with self.serving() as daemon:
+        with self.serving():
             session, backends = self.open()
             self.assertEqual(backends, ["httppost"])
             reply = session.send(type=2, codec="opus", seconds=12.5, tags=3)["reply"]
@@ -17,7 +17,6 @@ class Road(SystemTest):
             self.lab.received("events", 2)
             self.assertEqual(session.close(), 0)
             start, event, stop = self.lab.wait_for_events(3)
-            self.assertEqual(daemon.unexpected(), [])
         self.assertEqual((start["_method"], start["_status"], start["AutomaticTimeSet"], start["Locale"]),
                          (0, 0, True, "US"))
         self.assertEqual((stop["_method"], stop["_status"], stop["StorebagVersion"], stop["Opt"]), (0, 1, "v1", 0))
@@ -80,17 +79,15 @@ class Ctl(SystemTest):
             {"op": "restart", "backends": ["httppost"]}, {"op": "states", "backends": ["httppost"]}, {"op": "finish"}])
 
     def test_copies_between_answers(self):
-        lines = [json.dumps({"op": "send", "category": 5, "type": 2, "payload": {"number": n, "text": "a\nb"}})
-                 for n in range(100)]
+        send = '{"op":"send","category":5,"type":2,"payload":{"text":"a\\nb"}}\n'
         with self.serving("Failed to get remote object proxy: "):  # for the copies of the session's end
             out, _ = self.ctl("session", "--client-type", "7", "--session-id", "9", *IDENTITY, "--aggregate",
-                              input="\n".join(lines) + '\n{"op":"finish"}\n')
+                              input=send * 20 + '{"op":"finish"}\n')
         printed = [json.loads(line) for line in out.splitlines()]
-        self.assertEqual([line["op"] for line in printed[:2]], ["aggregated", "start"])
-        self.assertEqual([line["op"] for line in printed[2:-2]], ["aggregated", "send"] * 100)
-        for number, copy in enumerate(printed[2:-2:2]):
-            self.assertEqual(copy["payload"], {"number": number, "text": "a\nb", "clientName": "phone",
-                                               "serviceName": "ringer"})
+        self.assertEqual([line["op"] for line in printed],
+                         ["aggregated", "start", *["aggregated", "send"] * 20, "aggregated", "finish"])
+        for copy in printed[2:-2:2]:
+            self.assertEqual(copy["payload"], {"text": "a\nb", "clientName": "phone", "serviceName": "ringer"})
             self.assertEqual((copy["category"], copy["type"], copy["sessionInfo"]["sessionID"]), (5, 2, 9))
         self.assertEqual((printed[-2]["category"], printed[-2]["type"], printed[-2]["payload"]), (0, 2, None))
 
@@ -133,11 +130,9 @@ class Ctl(SystemTest):
         with self.serving("Could not find storebag name for client type 2"):
             self.ctl("send", "--client-type", "2", "--category", "1", "--type", "1")
             reason = "message dropped: the session has no back ends"
-
             path = self.root.path / "run/veltrad/counters.json"
             wait_until(lambda: path.exists() and reason in self.ctl("stats")[0], "a counted drop")
             self.assertEqual(json.loads(self.ctl("stats", "--json")[0])["counts"][reason], 1)
         # The session's own stop message is not missed.
-        self.assertEqual(json.loads(path.read_text())["counts"][reason], 1)
-        _, said = self.ctl("stats", status=1)
-        self.assertIn("not running", said)
+        self.assertEqual(self.counts()[reason], 1)
+        self.assertIn("not running", self.ctl("stats", status=1)[1])

@@ -8,6 +8,8 @@ import subprocess
 
 from harness import DEADLINE, DEVICE, START, SystemTest, Wire, program, wait_until
 
+NOBODY = 65534
+
 
 class Shortage(SystemTest):
     def limit(self, daemon, more=None):
@@ -56,13 +58,29 @@ class Shortage(SystemTest):
             self.limit(daemon, 0)
             for _ in range(2):
                 self.assertNotIn("httppost", client.call(START)["results"].get("backends", []))
-            self.assertEqual(self.lab.storebags(), [])
+            self.assertEqual(self.lab.received("storebags"), [])
             self.limit(daemon)
             self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
             client.call("sendMessageWithCategory:type:payload:reply:", category=5, type=1, payload={"after": True})
             event, = self.lab.wait_for_events(1, after=True)
             self.assertEqual(event["_build"], DEVICE["BuildVersion"])
             client.close()
+
+    def test_a_thread_that_cannot_be_had(self):
+        """The connection is there; the HTTP thread of the first request is not."""
+        options = {}
+        if os.getuid() == 0:  # whom no limit of threads binds
+            for path in (self.root.path, *self.root.path.rglob("*")):
+                os.chown(path, NOBODY, NOBODY)
+            options = {"user": NOBODY, "group": NOBODY, "extra_groups": []}
+        with self.serving(**options) as daemon:
+            first, second = Wire(self.root), Wire(self.root)
+            first.describe(6), second.describe(7)
+            for number, client, backends in ((1, first, None), (1000, second, ["httppost"])):
+                # By the daemon's own user: another one may lack the right.
+                subprocess.run(["prlimit", f"--pid={daemon.popen.pid}", f"--nproc={number}:"], check=True, **options)
+                self.assertEqual(client.call(START)["results"].get("backends"), backends)
+            first.close(), second.close()
 
     def test_entitlements_during_a_shortage(self):
         """However far a connection gets, the next one finds the rules as they are."""

@@ -15,7 +15,7 @@ class Conditional(SystemTest):
         with self.serving() as daemon:
             self.assertEqual(self.open()[1], ["httppost"])
             self.assertEqual(self.open()[1], ["httppost"])
-            first, second = self.lab.storebags(2)
+            first, second = self.lab.received("storebags", 2)
             self.assertEqual((first["outcome"], second["outcome"]), ("200", "304"))
             self.assertEqual(first["path"], "/storebags/maple/quindle?version=8.0")
             self.assertNotIn("If-Modified-Since", first["headers"])
@@ -25,7 +25,7 @@ class Conditional(SystemTest):
             session.send()
             session.close()
             self.assertEqual(self.lab.wait_for_events(1, _status=1, _method=0)[0]["StorebagVersion"], "v2")
-            third = self.lab.storebags(3)[2]
+            third = self.lab.received("storebags", 3)[2]
             self.assertEqual(third["outcome"], "200")
             self.assertEqual(third["headers"]["If-Modified-Since"], second["headers"]["If-Modified-Since"])
             # Not modified, but without the date: a failure, and the section stays.
@@ -36,7 +36,7 @@ class Conditional(SystemTest):
             self.assertEqual(self.open()[1], ["httppost"])
             daemon.wait_for_line("storebagForSession: Not fetching storebag for client type 7 - must wait 900 seconds "
                                  "between attempts")
-            self.assertEqual(len(self.lab.storebags()), 4)
+            self.assertEqual(len(self.lab.received("storebags")), 4)
 
 
 class Servers(SystemTest):
@@ -47,7 +47,7 @@ class Servers(SystemTest):
                                (self.lab.url.replace("https", "http"), False, 0), (self.lab.url, True, 2),
                                (self.lab.url, False, 0)):  # which nobody vouches for any more
             with self.subTest(url=url, cut=cut), self.serving(FAILED, SECTION, "mivo", "Mivo") as daemon:
-                before = len(self.lab.storebags())
+                before = len(self.lab.received("storebags"))
                 self.root.prefer(veltra_storebag_url=url)
                 self.lab.control(path="/", cutHalfway=cut)
                 self.assertIsNone(self.open(6)[1])
@@ -56,7 +56,7 @@ class Servers(SystemTest):
                 self.assertIsNotNone(self.open(7)[1])
                 daemon.wait_for_line("fetchStorebagWithName: Loading default storebag 'quindle'")
                 daemon.wait_for_line("fetchAndCacheStorebag: Storebag max age: 3600 seconds")
-                self.assertEqual(len(self.lab.storebags()) - before, came)
+                self.assertEqual(len(self.lab.received("storebags")) - before, came)
                 if cut:
                     (self.root.path / "etc/veltrad/ca.pem").unlink()
 

@@ -1,17 +1,14 @@
 """Hundreds of sessions of few identities at once, by clients that are killed, for VELTRA_STRESS_SECONDS."""
-import contextlib
 import os
 import pathlib
 import random
 import signal
-import socket
 import subprocess
 import sys
-import threading
 import time
 
 from harness import BUILD, Root, Wire, wait_until
-from test_https import NAMES, HTTPSTest, entry
+from test_https import HTTPSTest, entry
 
 SECONDS = float(os.environ.get("VELTRA_STRESS_SECONDS", "3"))
 CLIENTS, SESSIONS = 4, 60  # processes, and what each holds open at most
@@ -36,8 +33,7 @@ class Crowd:
 
     def join(self, _):
         wire = Wire(self.root)
-        self.answered(wire, NAMES, sessionInfo=self.info(), userInfo=self.identity(), frameworksToCheck=[],
-                      hasAggregationBlock=self.random.random() < 0.4)
+        wire.describe(aggregates=self.random.random() < 0.4, user_info=self.identity(), **self.info())
         assert "backends" in self.answered(wire, "startConfigWithCompletionHandler:"), "no back ends"
         self.sessions.append(wire)
 
@@ -80,34 +76,17 @@ class Stress(HTTPSTest):
         return subprocess.Popen([sys.executable, __file__, str(self.root.path), str(seed)], stderr=subprocess.PIPE)
 
     def left_over(self, daemon):
-        """Descriptors (but for connections that are kept and the message log), threads, and resident MiB."""
-        proc = pathlib.Path(f"/proc/{daemon.popen.pid}")
-        status = dict(line.split(":", 1) for line in (proc / "status").read_text().splitlines())
-        files = []
-        for descriptor in (proc / "fd").iterdir():
-            with contextlib.suppress(FileNotFoundError):  # closed meanwhile
-                files.append(os.readlink(descriptor))
-        own = [name for name in files if not name.startswith("socket:") and not name.endswith("messageLog.diag")]
-        return sorted(own), int(status["Threads"]), int(status["VmRSS"].split()[0]) // 1024
+        """How many descriptors, but for connections that are kept, and threads."""
+        own = [name for name in daemon.descriptors() if not name.startswith("socket:")]
+        return len(own), daemon.status("Threads")
 
     def test_crowds_come_and_are_killed(self):
         for level, (kind, name) in enumerate(LEVELS.items()):
             self.serve(entry("alpha,beta,gamma", hierarchy=level), name=name)
-        manager = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        self.addCleanup(manager.close)
-        manager.bind(str(self.root.path / "notify"))
-        states = []
-
-        def listen():
-            while told := manager.recv(4096).decode():
-                states.extend(line for line in told.splitlines() if line.startswith("STATUS="))
-        threading.Thread(target=listen, daemon=True).start()
         allowed = "sendMessageWithDictionary: Failed to get remote object proxy: The client "
-        with self.serving(allowed, env={"VELTRA_LOG": "info", "NOTIFY_SOCKET": str(self.root.path / "notify")}) as daemon:
-            for _ in range(2):  # so that what is made once is there
-                self.open()[0].close()
-            wait_until(lambda: states and states[-1] == "STATUS=Idle: no sessions", "idle")
-            before = self.left_over(daemon)
+        with self.serving(allowed, env={"VELTRA_LOG": "info"}) as daemon:
+            self.open()[0].close()  # so that what is made once is there
+            before, memory = self.left_over(daemon), daemon.status("VmRSS")
             seeds = iter(range(1 << 30))
             clients = [self.start(next(seeds)) for _ in range(CLIENTS)]
             end, fate = time.monotonic() + SECONDS, random.Random(0)
@@ -118,15 +97,13 @@ class Stress(HTTPSTest):
                 clients[at] = self.start(next(seeds))
             for client in clients:
                 self.killed(client)
-            wait_until(lambda: states[-1] == "STATUS=Idle: no sessions", "all sessions end", 60)
-            wait_until(lambda: self.left_over(daemon)[:2] == before[:2], "as many descriptors and threads as before",
-                       also=lambda: (before, self.left_over(daemon)))
+            wait_until(lambda: all(now <= then for now, then in zip(self.left_over(daemon), before)),
+                       "as many descriptors and threads as before", 60, lambda: (before, self.left_over(daemon)))
             if BUILD.name not in ("asan", "tsan"):
-                wait_until(lambda: self.left_over(daemon)[2] <= before[2] + 12, "memory near its start")
+                wait_until(lambda: daemon.status("VmRSS") <= memory + (12 << 10), "memory near its start")
 
     def killed(self, client):
-        if client.poll() is None:
-            client.send_signal(signal.SIGKILL)
+        client.kill()
         self.assertEqual(client.wait(), -signal.SIGKILL, client.stderr.read().decode())
         client.stderr.close()
 

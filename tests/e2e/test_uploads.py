@@ -2,14 +2,14 @@
 import hashlib
 import json
 import os
-import pathlib
 import resource
 import socket
 import subprocess
 import sys
 import unittest
+from contextlib import closing
 
-from harness import DEVICE, SystemTest, Wire, closed_port, program, storebag, wait_until
+from harness import BUILD, DEVICE, SystemTest, Wire, program, storebag, wait_until
 from served import FLUSH, GETATTR, READ, Served
 
 OP = "uploadFileAtPath:extensionToken:completionHandler:"
@@ -46,24 +46,9 @@ class Uploads(SystemTest):
             frames.append(wire.frame())
         return frames
 
-    def hang(self, count):
-        """So many sessions of which each has begun an upload; two uploads have reached the server."""
-        self.lab.control(path="/upload", stall=True)
-        sessions = [self.open(session_id=number)[0] for number in range(count)]
-        for number, session in enumerate(sessions):
-            session.say(op="uploadFile", path=os.fsdecode(self.make(str(number))))
-        self.lab.received("uploads", 2)
-        return sessions
-
-    def descriptors(self, process):
-        """But for the message log, which is opened when its first line is written."""
-        names = pathlib.Path(f"/proc/{process.popen.pid}/fd").iterdir()
-        return sum(os.path.islink(name) and not os.readlink(name).endswith("messageLog.diag") for name in names)
-
     def fates(self):
         """What the run that has ended counted of files."""
-        counts = json.loads(self.ctl("stats", "--json", status=1)[0])["counts"]
-        return {key: count for key, count in counts.items() if key.startswith("file ")}
+        return {key: count for key, count in self.counts().items() if key.startswith("file ")}
 
     def test_request_and_its_file(self):
         content = os.urandom(1 << 20)  # too much to stay in memory
@@ -92,16 +77,13 @@ class Uploads(SystemTest):
         kinds = {
             "missing": (lambda path: None, "cannot be opened: No such file", REGULAR),
             "directory": (os.mkdir, "is a directory", REGULAR),
-            "directory/": (lambda path: None, "cannot be opened", REGULAR),
             "link": (lambda path: os.symlink(real, path), "is a symbolic link", REGULAR),
             "fifo": (os.mkfifo, "is a FIFO", REGULAR),
-            "socket": (lambda path: socket.socket(socket.AF_UNIX).bind(path), "is a socket", REGULAR),
             "/dev/null": (lambda path: None, "is a device", REGULAR),
             "empty": (lambda path: open(path, "w").close(), "is empty", EMPTY),
             "large": (lambda path: os.truncate(self.make("large"), 1 << 31), "has 2147483648 bytes",
                       "has 2147483648 bytes: at most 2147483647 are uploaded"),
         }
-        seen = []
         with self.serving("Only upload", EMPTY, "at most 2147483647", "File upload failed") as daemon:
             for name, (make, problem, line) in kinds.items():
                 with self.subTest(name):
@@ -110,11 +92,10 @@ class Uploads(SystemTest):
                     answer, said = self.upload(path, status=1)
                     self.assertEqual(answer, {"op": "uploadFile", "uploaded": False})
                     self.assertIn(f"Not uploaded: {path} {problem}", said)
-                    seen.append(line)
-                    daemon.wait_for_line(line, seen.count(line))
+                    daemon.wait_for_line(line)
             daemon.wait_for_line("File upload failed for", len(kinds))
         self.assertEqual(self.fates(),
-                         {"file refused: nothing lent, or no regular file": 7, "file refused: too large": 1,
+                         {"file refused: nothing lent, or no regular file": 5, "file refused: too large": 1,
                           "file refused: empty or unreadable": 1})
         self.assertTrue(os.path.exists(real))
         self.assertEqual(self.lab.received("uploads"), [])
@@ -134,14 +115,14 @@ class Uploads(SystemTest):
             confirm = [(Wire.EVENT, 0, {"op": "removeUploadedFile:", "args": {"call": 1001}}),
                        (Wire.REPLY, 1001, {"results": {"uploaded": True}})]
             self.assertEqual(self.lend(client, good, os.fsdecode(secret)), confirm)
-            before = self.descriptors(daemon)
+            before = daemon.descriptors()
             for name, descriptor in bad.items():
                 with self.subTest(name):
                     (_, _, reply), = self.lend(client, descriptor)
                     self.assertEqual(reply, {"results": {"uploaded": False}})
             client.send(Wire.CALL, {"op": OP, "args": {"path": "/y/silent"}}, 0, 1, [good])  # asks for no reply
             self.assertEqual([frame[0] for frame in self.lend(client, good)], [Wire.EVENT, Wire.REPLY])
-            wait_until(lambda: self.descriptors(daemon) <= before, f"descriptors back to {before}")
+            wait_until(lambda: len(daemon.descriptors()) <= len(before), f"descriptors back to {before}")
             daemon.wait_for_line(REGULAR, 5)
             daemon.wait_for_line(EMPTY, 3)
             uploads = self.lab.received("uploads", 3)
@@ -170,22 +151,9 @@ class Uploads(SystemTest):
                                         "file confirmed: its removal was asked for": 1,
                                         "file lost: the exchange with the server failed": 2})
 
-    def test_addresses(self):
-        for section, status, said, line in [
-                ({"post_url": f"https://localhost:{closed_port()}/"}, 0, "", "post Failed to connect"),
-                ({"post_url": "https://localhost/a b"}, 1, "", "Unable to create URL request"),
-                ({"display_url": "https://x/"}, 1, "Nobody took", "can't resolve upload post URL.")]:
-            with self.subTest(section), self.serving(line, "File upload failed") as daemon:
-                self.lab.put("quindle", storebag(backends={"uploadserver": section}))
-                self.assertIn(said, self.upload(self.make(), status)[1])
-                daemon.wait_for_line(line)
-        self.assertEqual(os.listdir(self.files), ["a b.log"])
-
     def test_files_that_change_before_the_answer(self):
         changes = {
             "grows": (lambda path: open(path, "ab").write(b"more"), CHANGED, None),
-            "shrinks": (lambda path: os.truncate(path, 5), CHANGED, None),
-            "rewritten": (lambda path: open(path, "r+b").write(b"SOME"), CHANGED, None),
             "replaced": (lambda path: os.replace(self.make("other"), path), None, "another file has taken its place"),
             "linked": (lambda path: (os.unlink(path), os.symlink("/etc/passwd", path)), None, "another file has taken"),
             "gone": (os.unlink, None, "cannot be found any more: No such file"),
@@ -209,7 +177,11 @@ class Uploads(SystemTest):
 
     def test_a_stop_waits_for_no_upload(self):
         with self.serving("The daemon is stopping", "File upload failed") as daemon:
-            sessions = self.hang(4)
+            self.lab.control(path="/upload", stall=True)
+            sessions = [self.open(session_id=number)[0] for number in range(4)]
+            for number, session in enumerate(sessions):
+                session.say(op="uploadFile", path=os.fsdecode(self.make(str(number))))
+            self.lab.received("uploads", 2)
             daemon.wait_for_line("uploadFileAtPath: Uploading file for session", 4)
         self.assertEqual(sorted(session.answer()["uploaded"] for session in sessions), [False, False, True, True])
         self.assertEqual(len(os.listdir(self.files)), 4)
@@ -220,13 +192,11 @@ class Uploads(SystemTest):
         path = self.make("noise", os.urandom(64 << 20))
         scratch = self.root.path / "var/lib/veltrad/preferences"
         with self.serving("No room for the compressed bytes", "File upload failed") as daemon:
-            def memory(key):
-                with open(f"/proc/{daemon.popen.pid}/status") as status:
-                    return int(next(line.split()[1] for line in status if line.startswith(key))) >> 10
             self.upload(self.make("first"))
-            before, files = memory("VmRSS"), os.listdir(scratch)
+            before, files = daemon.status("VmRSS"), os.listdir(scratch)
             self.upload(path)
-            self.assertLess(memory("VmHWM"), before + 8)
+            if BUILD.name not in ("asan", "tsan"):  # a sanitizer keeps memory of its own
+                self.assertLess(daemon.status("VmHWM"), before + (8 << 10))
             resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE, (1 << 20,) * 2)
             path = self.make("noise", os.urandom(2 << 20))
             self.upload(path, status=1)
@@ -235,18 +205,6 @@ class Uploads(SystemTest):
         self.assertTrue(os.path.exists(path))
         self.assertEqual(self.fates(), {"file uploaded": 2, "file confirmed: its removal was asked for": 2,
                                         "file lost: no room for its compressed bytes": 1})
-
-    @unittest.skipUnless(os.getuid() == 0, "needs a second user")
-    def test_places(self):
-        """Two uploads of one user that hang, and a third that waits, leave a place to another user."""
-        self.root.path.chmod(0o755)
-        self.root.grant([{"uid": uid, "entitlements": {"com.florn.private.veltrad": True}} for uid in (0, 65534)])
-        with self.serving("The daemon is stopping", "File upload failed"):
-            self.hang(3)
-            other = subprocess.Popen(self.UPLOAD + [self.make("other")], env=self.root.environment(), user=65534,
-                                     stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
-            self.assertEqual(self.lab.received("uploads", 3)[2]["query"]["filename"], "other.gz")
-        other.wait()
 
     def test_files_that_are_swapped(self):
         """Somebody exchanges the path's file with another one all the while: only what was uploaded ever goes."""
@@ -257,7 +215,7 @@ class Uploads(SystemTest):
         removed = 0
         with self.serving(CHANGED):
             session, _ = self.open()
-            before = self.descriptors(session)
+            before = session.descriptors()
             for number in range(150):
                 held = {}
                 for place in (path, spare):
@@ -274,9 +232,7 @@ class Uploads(SystemTest):
                     os.close(descriptor)
                 while left := list(self.files.iterdir()):  # the swapper moves them meanwhile
                     left[0].unlink(missing_ok=True)
-            self.assertEqual(self.descriptors(session), before)
-        swapper.kill()
-        swapper.wait()
+            self.assertEqual(session.descriptors(), before)
         self.assertGreater(removed, 0)
 
     @unittest.skipUnless(os.getuid() == 0 and os.path.exists("/dev/fuse"), "needs the right to mount")
@@ -285,8 +241,7 @@ class Uploads(SystemTest):
         place = self.root.path / "served"
         place.mkdir()
         served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})
-        with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon:
-            self.addCleanup(served.end)  # before the daemon is killed, which may wait for it
+        with self.serving("lies on a file system of type fuse.served", "File upload failed") as daemon, closing(served):
             client = self.started()
             hanging = os.open(place / "hangs", os.O_RDONLY)
             served.silent, asked = (READ, GETATTR), len(served.asked)
@@ -296,13 +251,12 @@ class Uploads(SystemTest):
             self.assertLessEqual(set(served.asked[asked:]), {FLUSH})
             served.silent = ()
             os.close(hanging)
+            self.lab.control(path="/upload", times=2, body="stored")
             for name in ("small", "large"):
-                self.assertIn("Uploaded and removed", self.upload(os.fsencode(place / name))[1])
-            self.assertEqual(list(served.nodes), [b"hangs"])
-            path = self.make()
-            subprocess.run(["unshare", "-m", *self.UPLOAD, path], env=self.root.environment(), check=True,
+                self.assertIn("has not confirmed it", self.upload(os.fsencode(place / name))[1])
+            subprocess.run(["unshare", "-m", *self.UPLOAD, self.make()], env=self.root.environment(), check=True,
                            capture_output=True)
             digests = [line["plainSHA256"] for line in self.lab.received("uploads", 3)]
         self.assertEqual(digests[:2], [hashlib.sha256(content).hexdigest() for content in (b"served", bytes(9 << 20))])
-        self.assertEqual(self.fates(), {"file refused: others serve its file system": 4, "file uploaded": 3,
-                                        "file confirmed: its removal was asked for": 3})
+        self.assertEqual(self.fates(), {"file refused: others serve its file system": 4, "file not confirmed": 2,
+                                        "file uploaded": 1, "file confirmed: its removal was asked for": 1})

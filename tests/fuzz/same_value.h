@@ -18,16 +18,13 @@ inline bool same(double a, double b) {
 inline bool same(const Value& a, const Value& b) {
   if (a.asReal() && b.asReal()) return same(*a.asReal(), *b.asReal());
   if (a.asDate() && b.asDate()) return same(a.asDate()->secondsSince1970, b.asDate()->secondsSince1970);
-  if (a.asArray() && b.asArray()) {
-    return std::equal(a.asArray()->begin(), a.asArray()->end(), b.asArray()->begin(), b.asArray()->end(),
-                      [](const Value& x, const Value& y) { return same(x, y); });
-  }
-  if (a.asDictionary() && b.asDictionary()) {
-    return std::equal(a.asDictionary()->begin(), a.asDictionary()->end(), b.asDictionary()->begin(),
-                      b.asDictionary()->end(), [](const auto& x, const auto& y) {
-                        return x.first == y.first && same(x.second, y.second);
-                      });
-  }
+  const auto sameValues = [](const Value& x, const Value& y) { return same(x, y); };
+  const auto sameEntries = [](const auto& x, const auto& y) {
+    return x.first == y.first && same(x.second, y.second);
+  };
+  if (a.asArray() && b.asArray()) return std::ranges::equal(*a.asArray(), *b.asArray(), sameValues);
+  if (a.asDictionary() && b.asDictionary())
+    return std::ranges::equal(*a.asDictionary(), *b.asDictionary(), sameEntries);
   return a == b;
 }
 
