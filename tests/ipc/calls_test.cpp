@@ -1,8 +1,48 @@
-// What becomes of the reply to a call.
+// What a call must hold, and what becomes of its reply.
 #include "harness.h"
 
 namespace veltrad::ipc_test {
 namespace {
+
+TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
+  const auto call = [](const char* op, Dictionary arguments) {
+    return callFrame(9, op, std::move(arguments));
+  };
+  const std::vector<std::pair<std::string, const char*>> cases{
+      {rawFrame(FrameKind::call, ""), "the body is no readable property list"},
+      {rawFrame(FrameKind::call, "bplist00 and then rubbish"), "the body is no readable property list"},
+      {rawFrame(FrameKind::call, writeBinaryPropertyList(Array{1})), "the body must be a dictionary"},
+      {ipc::makeFrame(FrameKind::call, 9, {{"args", Dictionary{}}}), "\"op\" must be a text"},
+      {call("launch:", {}), "unknown operation \"launch:\""},
+      {call(kSend, {{"category", "5"}, {"type", 1}}), "argument \"category\" must be a number"},
+      {call(kSend, {{"category", 5}}), "argument \"type\" must be a number"},
+      {call("sendMessageWithDictionary:reply:", {{"message", 1}}),
+       "argument \"message\" must be a dictionary"},
+      {call(kOneShot, {{"type", 1}}), "argument \"category\" must be a number"},
+      {callFrame(9, kSend, {}, FrameKind::largeCall),
+       "a large call is for \"uploadLogData:completionHandler:\" alone"},
+      {rawFrame(FrameKind::reply, writeBinaryPropertyList(Dictionary{})), "not of kind 3"},
+      {rawFrame(static_cast<FrameKind>(200), ""), "not of kind 200"},
+  };
+  Door door;
+  WireEnd client = door.client();
+  for (const auto& [bytes, why] : cases) {
+    client.send(bytes);
+    const Received reply = client.next();
+    EXPECT_EQ(reply.kind, FrameKind::reply);
+    EXPECT_EQ(reply.callID, 9u);
+    EXPECT_THAT(reply.description(), HasSubstr(why));
+  }
+  // Without a call id nothing comes back, and what follows is served.
+  // Numbers come as they fit; what may be absent and is of another type counts as absent.
+  client.send(callFrame(0, "launch:") +
+              callFrame(10, kSend, {{"category", 65'543}, {"type", 2.9}, {"payload", "x"}}));
+  EXPECT_EQ(client.next().callID, 10u);
+  std::vector<std::string> expected(cases.size() + 1, "interrupted");
+  expected.push_back("sendMessage 7 2 none");
+  EXPECT_EQ(door.journal.lines(), expected);
+  EXPECT_EQ(door.counters.value("call refused: it cannot be read"), cases.size() + 1);
+}
 
 TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   Door door;

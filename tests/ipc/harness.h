@@ -17,6 +17,7 @@ using ::testing::HasSubstr;
 
 inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
 inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
+inline constexpr const char* kOneShot = "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
 
 inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds time) {
   return std::chrono::steady_clock::now() + time;
