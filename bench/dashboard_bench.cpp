@@ -53,9 +53,10 @@ int main() {
       getsockname(server, reinterpret_cast<sockaddr*>(&address), &length) != 0)
     return 1;
   World world;
-  LogDataUploads uploads(world.http);
+  backends::LogDataUploads uploads(world.http);
   const Dictionary section{{"ip", "127.0.0.1"}, {"port", int{ntohs(address.sin_port)}}};
-  const auto backend = DashboardBackend::initWithName(world.services, uploads, "dashboard", &section, "Elm");
+  const auto backend =
+      backends::DashboardBackend::initWithName(world.services, uploads, "dashboard", &section, "Elm");
   if (!backend) return 1;
   backend->setCompType(7);
   backend->setUdid(std::string(40, 'a'));
@@ -66,7 +67,7 @@ int main() {
 
   const int bare = socket(AF_INET, SOCK_DGRAM, 0);
   if (connect(bare, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return 1;
-  backend->VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0);
+  backend->backends::VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0);
   char first[2048];
   const auto bytes = static_cast<std::size_t>(recv(server, first, sizeof first, 0));
   std::thread drain([server] {
@@ -79,7 +80,9 @@ int main() {
   std::vector<double> floors, whole, ratios;
   for (int round = 0; round < kRounds; ++round) {
     floors.push_back(microsecondsOf([&] { (void)send(bare, same.data(), same.size(), MSG_DONTWAIT); }));
-    whole.push_back(microsecondsOf([&] { backend->VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0); }));
+    whole.push_back(microsecondsOf([&] {
+      backend->backends::VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0);
+    }));
     ratios.push_back(whole.back() / floors.back());
   }
   fmt::print("{{\"bareSendUs\": {:.2f}, \"messageUs\": {:.2f}, \"ratio\": {:.2f}, \"bytes\": {}}}\n",

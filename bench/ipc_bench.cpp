@@ -14,9 +14,9 @@
 #include <thread>
 #include <vector>
 
-#include "ipc/frame.h"
 #include "ipc/socket_connection.h"
 #include "platform/file_store.h"
+#include "wire/frame.h"
 
 namespace {
 
@@ -27,26 +27,28 @@ using Clock = std::chrono::steady_clock;
 constexpr int kRounds = 400;
 constexpr int kCallsARound = 200;
 
-class EchoingSession final : public ClientSessionInterface {
+class EchoingSession final : public wire::ClientSessionInterface {
  public:
-  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+  bool setSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::optional<Array>,
+                      bool) override {
     return true;
   }
-  void startConfigWithCompletionHandler(NamesReply) override {}
-  void fetchStatesWithUserInfo(OptionalDictionary, NamesReply) override {}
-  void fetchDisplayURL(StringReply) override {}
-  void sendMessageWithCategory(std::uint16_t, std::uint16_t, OptionalDictionary, StringReply reply) override {
+  void startConfigWithCompletionHandler(wire::NamesReply) override {}
+  void fetchStatesWithUserInfo(wire::OptionalDictionary, wire::NamesReply) override {}
+  void fetchDisplayURL(wire::StringReply) override {}
+  void sendMessageWithCategory(std::uint16_t, std::uint16_t, wire::OptionalDictionary,
+                               wire::StringReply reply) override {
     if (reply) reply("queued");
   }
-  void sendMessageWithDictionary(Dictionary, StringReply) override {}
-  void flushMessagesWithCompletion(FlushReply reply) override {
+  void sendMessageWithDictionary(Dictionary, wire::StringReply) override {}
+  void flushMessagesWithCompletion(wire::FlushReply reply) override {
     if (reply) reply(std::nullopt, std::nullopt);
   }
-  void finishSessionWithReply(StringReply) override {}
-  void uploadFileAtPath(std::string, std::string, BooleanReply) override {}
-  void uploadLogData(Array, UploadLogDataReply) override {}
-  void sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t, std::uint16_t,
-                                  OptionalDictionary, StringReply) override {}
+  void finishSessionWithReply(wire::StringReply) override {}
+  void uploadFileAtPath(std::string, std::string, wire::BooleanReply) override {}
+  void uploadLogData(Array, wire::UploadLogDataReply) override {}
+  void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
+                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply) override {}
   void end() override {}
   std::string description() const override { return "echoing session"; }
 };
@@ -58,7 +60,7 @@ std::string callFrame(std::uint32_t id) {
   payload.set("count", 42);
   Dictionary body{{"op", "sendMessageWithCategory:type:payload:reply:"}};
   body.set("args", Dictionary{{"category", 5}, {"type", 1}, {"payload", std::move(payload)}});
-  return ipc::makeFrame(ipc::FrameKind::call, id, std::move(body));
+  return wire::makeFrame(wire::FrameKind::call, id, std::move(body));
 }
 
 void pinTo(int core) {
@@ -102,11 +104,11 @@ struct Ends {
   Ends() {
     int ends[2];
     if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) std::exit(1);
-    client = platform::FileDescriptor(ends[0]);
-    server = platform::FileDescriptor(ends[1]);
+    client = FileDescriptor(ends[0]);
+    server = FileDescriptor(ends[1]);
   }
-  platform::FileDescriptor client;
-  platform::FileDescriptor server;
+  FileDescriptor client;
+  FileDescriptor server;
 };
 
 double quantile(std::vector<double> values, double part) {
@@ -119,7 +121,7 @@ void compare(const char* name, int core) {
   pinTo(core);
   const std::string request = callFrame(1);
   const std::string reply =
-      ipc::makeFrame(ipc::FrameKind::reply, 1, {{"results", Dictionary{{"reply", "queued"}}}});
+      wire::makeFrame(wire::FrameKind::reply, 1, {{"results", Dictionary{{"reply", "queued"}}}});
 
   Ends bare;
   std::thread echo([&] {
@@ -128,19 +130,19 @@ void compare(const char* name, int core) {
   });
 
   platform::DiskFileStore files;
-  platform::Entitlements entitlements(files, "/nonexistent");
+  ipc::Entitlements entitlements(files, "/nonexistent");
   platform::LentFiles lentFiles;
   platform::Counters counters;
   Ends served;
   const auto connection =
-      std::make_shared<ipc::SocketConnection>(1, std::move(served.server), platform::Peer{}, entitlements,
+      std::make_shared<ipc::SocketConnection>(1, std::move(served.server), ipc::Peer{}, entitlements,
                                               lentFiles, counters, platform::MemoryBudget().accountOf(0));
   connection->setExportedObject(std::make_shared<EchoingSession>());
   connection->resume();
   std::thread serving([&] { connection->run(); });
-  const std::string hello = ipc::makeFrame(ipc::FrameKind::hello, 0, {{"wire", 1}, {"library", "8.0"}});
+  const std::string hello = wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", 1}, {"library", "8.0"}});
   const std::size_t answer =
-      ipc::makeFrame(ipc::FrameKind::hello, 0, {{"wire", 1}, {"daemon", "8.0"}}).size();
+      wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", 1}, {"daemon", "8.0"}}).size();
   sendAll(served.client.get(), hello);
   receiveAll(served.client.get(), answer);
 

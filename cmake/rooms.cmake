@@ -26,9 +26,23 @@ target_link_libraries(veltra_options INTERFACE Threads::Threads)
 # A program loads only the libraries that it uses itself, not all that its rooms could use.
 target_link_options(veltra_options INTERFACE -Wl,--as-needed)
 
+# veltra_rung(NAME…): the rooms of the next rung. They know the rooms of the rungs before, and nothing of each other.
+macro(veltra_rung)
+  foreach(room ${ARGN})
+    add_subdirectory(${room})
+  endforeach()
+  list(APPEND VELTRA_ROOMS_BELOW ${ARGN})
+endmacro()
+
 # veltra_room(NAME [PUBLIC libs…] [PRIVATE libs…] [EXCLUDE regex]): the sources are every .cpp under the folder.
 function(veltra_room name)
   cmake_parse_arguments(ROOM "" "EXCLUDE" "PUBLIC;PRIVATE" ${ARGN})
+  foreach(library ${ROOM_PUBLIC} ${ROOM_PRIVATE})
+    string(REGEX REPLACE "^veltra_" "" below "${library}")
+    if(library MATCHES "^veltra_" AND NOT below IN_LIST VELTRA_ROOMS_BELOW)
+      message(FATAL_ERROR "${name} links ${below}, which is on no rung below its own")
+    endif()
+  endforeach()
   file(GLOB_RECURSE sources CONFIGURE_DEPENDS ${CMAKE_CURRENT_SOURCE_DIR}/*.cpp)
   if(ROOM_EXCLUDE)
     list(FILTER sources EXCLUDE REGEX "${ROOM_EXCLUDE}")

@@ -5,12 +5,9 @@ import sys
 from pathlib import Path
 
 ROOT = Path(__file__).resolve().parent.parent
-# Each room may include itself and the rooms that it lists; the ladder of docs/architecture.md.
-LADDER = ["base", "platform", "protocol", "ipc", "support", "config", "backends", "session", "daemon", "tools"]
-BELOW = {room: set(LADDER[:index]) for index, room in enumerate(LADDER)}
-BELOW["client"] = {"base", "platform", "protocol", "ipc"}
-BELOW["tools"] = {"base", "platform", "protocol", "support", "config", "client"}
-BELOW["support"] = {"base", "platform", "protocol"}
+# The ladder stands in src/CMakeLists.txt: a rung a line, lowest first.
+RUNGS = [line.split() for line in re.findall(r"^veltra_rung\((.*)\)$", (ROOT / "src/CMakeLists.txt").read_text(), re.M)]
+RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
 # Backend kinds know nothing of each other.
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
 LONGEST_BODY = 400
@@ -44,7 +41,7 @@ def check_ladder():
                 continue
             target = match[1]
             place = f"{path.relative_to(ROOT)}:{number}"
-            if target in BELOW and target != room and target not in BELOW.get(room, set()):
+            if target in RUNG_OF and target != room and RUNG_OF[target] >= RUNG_OF[room]:
                 found.append(f"{place}: {room} includes {target}, which is not below it")
             kind = parts[2] if room == "backends" and len(parts) > 3 else None
             if kind in KINDS and target == "backends" and match[2].split("/")[0] in set(KINDS) - {kind}:

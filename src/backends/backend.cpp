@@ -7,7 +7,7 @@
 
 #include "platform/random.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 VeltraBackend::VeltraBackend(std::string name, Dictionary profile, std::string productFamily,
                              platform::Random& random)
@@ -116,4 +116,4 @@ void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
   _samplingThreshold = value;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

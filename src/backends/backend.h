@@ -13,14 +13,14 @@
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
-#include "protocol/error.h"
+#include "wire/error.h"
 
-namespace veltrad {
-
-namespace platform {
+namespace veltrad::platform {
 class MemoryAccount;
 class Random;
-}  // namespace platform
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
 
 using SharedDictionary = std::shared_ptr<const Dictionary>;
 
@@ -36,7 +36,8 @@ enum BackendState : std::int32_t {
 class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  public:
   // A result text or none, an error or none; may run on another thread, exactly once.
-  using FlushCompletion = std::function<void(std::optional<std::string>, std::optional<ReportingError>)>;
+  using FlushCompletion =
+      std::function<void(std::optional<std::string>, std::optional<wire::ReportingError>)>;
 
   virtual ~VeltraBackend() = default;
   VeltraBackend(const VeltraBackend&) = delete;
@@ -153,4 +154,4 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::optional<double> _samplingThreshold GUARDED_BY(_propertyMutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

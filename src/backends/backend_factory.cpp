@@ -7,10 +7,10 @@
 #include "backends/mivo/mivo_backend.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
-#include "protocol/constants.h"
 #include "support/device_identity.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 // A device of this product type has no adaptor.
@@ -20,22 +20,22 @@ constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
-  if (name == kVeltraBackendDashboard) {
+  if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName({_services, _logData, _dashboards, owner}, name,
                                           profile.asDictionary(), productFamily.value_or(""));
   }
-  if (name == kVeltraBackendUploadServer) {
+  if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName(_services, _files, name, profile.asDictionary(),
                                        productFamily.value_or(""));
   }
-  if (name == kVeltraBackendHTTPPost || name == kVeltraBackendHTTPPost2) {
+  if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
     return HTTPSPostBackend::initWithName(_services, _postErrors, name, profile.asDictionary(),
                                           productFamily);
   }
-  if (name == kVeltraBackendAmpery) {
+  if (name == wire::kVeltraBackendAmpery) {
     return AmperyBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""));
   }
-  if (name == kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
+  if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""),
                                      clientType);
   }
@@ -43,4 +43,4 @@ std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
   return nullptr;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

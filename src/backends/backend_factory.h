@@ -11,37 +11,47 @@
 #include "backends/https/post_errors.h"
 #include "backends/upload/file_uploads.h"
 
-namespace veltrad {
-
-class DeviceIdentity;
+namespace veltrad::config {
 class ProcessSettings;
-class Veltra;
-namespace platform {
-class Clock;
-class CodeBundle;
-class Counters;
-class EnergyLog;
+}  // namespace veltrad::config
+
+namespace veltrad::http {
 class HTTPClient;
+}  // namespace veltrad::http
+
+namespace veltrad::platform {
+class Clock;
+class Counters;
 class LentFiles;
 class Locale;
 class Preferences;
+}  // namespace veltrad::platform
+
+namespace veltrad::support {
+class DeviceIdentity;
+class Veltra;
+}  // namespace veltrad::support
+
+namespace veltrad::backends {
+
+class CodeBundle;
+class EnergyLog;
 class WorkPool;
-}  // namespace platform
 
 // What the kinds of backends use; each takes its own few. Everything outlives the backends.
 struct BackendServices {
-  platform::HTTPClient& http;
+  http::HTTPClient& http;
   platform::Clock& clock;
   platform::Random& random;
   platform::Locale& locale;
   platform::Preferences& preferences;
   platform::Counters& counters;
-  platform::EnergyLog& energyLog;
-  platform::CodeBundle& adaptorBundle;
-  ProcessSettings& settings;
-  DeviceIdentity& device;
-  const Veltra& library;
-  platform::WorkPool& pool;
+  EnergyLog& energyLog;
+  CodeBundle& adaptorBundle;
+  config::ProcessSettings& settings;
+  support::DeviceIdentity& device;
+  const support::Veltra& library;
+  WorkPool& pool;
   platform::LentFiles& lentFiles;
   std::string scratchDirectory = "/tmp";  // for files without a name
 };
@@ -81,4 +91,4 @@ class StandardBackendFactory final : public BackendFactory {
   FileUploads _files;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -1,14 +1,9 @@
-// Tells the two forms of property lists apart. Any thread.
+// What a reader of binary lists can be told before and after it reads.
 #include "base/property_list.h"
 
 #include "base/property_list_binary.h"
 
 namespace veltrad {
-
-Result<Value, PropertyListError> parsePropertyList(std::string_view bytes, const PropertyListLimits& limits) {
-  return bytes.starts_with("bplist") ? parseBinaryPropertyList(bytes, limits)
-                                     : parseXMLPropertyList(bytes, limits);
-}
 
 std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
   using namespace binary_property_list;

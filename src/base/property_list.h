@@ -1,6 +1,5 @@
-// Property lists, binary (version "bplist00") and XML, both directions. Pure functions from bytes to values
-// and back; any thread. Format: a trailer-first table of offsets, and the XML document type "plist"
-// version 1.0.
+// Binary property lists (version "bplist00": a table of offsets, trailer first), both directions, and what
+// every reader of property lists is bounded by. Pure functions from bytes to values and back.
 #pragma once
 
 #include <cstdint>
@@ -38,13 +37,8 @@ struct PropertyListError {
   std::string detail;  // one line for the log: what is wrong and where
 };
 
-// Either form, told apart by the first bytes.
-Result<Value, PropertyListError> parsePropertyList(std::string_view bytes,
-                                                   const PropertyListLimits& limits = {});
 Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
                                                          const PropertyListLimits& limits = {});
-Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes,
-                                                      const PropertyListLimits& limits = {});
 
 // The objects that the trailer of a binary list counts, shared ones once; nothing: there is no such trailer.
 std::optional<std::uint64_t> declaredObjects(std::string_view bytes);
@@ -55,8 +49,5 @@ std::size_t objectsIn(const Value& value);
 std::string writeBinaryPropertyList(const Value& value);
 // Appends to `out`, so that a caller can put a header in front without a copy.
 void appendBinaryPropertyList(const Value& value, std::string& out);
-// Characters that XML cannot hold become U+FFFD; dates are rounded down to whole seconds and kept within the
-// years 0 to 9999.
-std::string writeXMLPropertyList(const Value& value);
 
 }  // namespace veltrad

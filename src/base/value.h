@@ -14,8 +14,9 @@
 
 namespace veltrad {
 
-class Value;
 class Dictionary;
+class Value;
+
 using Array = std::vector<Value>;
 
 // Seconds since 1970-01-01 00:00:00 UTC, with fraction. (Property lists count from 2001; the codecs convert.)

@@ -2,10 +2,10 @@
 #include "client/answer.h"
 
 #include "base/property_list.h"
-#include "protocol/constants.h"
-#include "protocol/limits.h"
+#include "wire/constants.h"
+#include "wire/limits.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
@@ -18,8 +18,8 @@ Answer unreadable() {
 
 }  // namespace
 
-ReportingError errorOfDictionary(const Dictionary& dictionary) {
-  ReportingError error;
+wire::ReportingError errorOfDictionary(const Dictionary& dictionary) {
+  wire::ReportingError error;
   if (const std::string* domain = dictionary.string("domain")) error.domain = *domain;
   const Value* code = dictionary.find("code");
   error.code = code ? code->toInt64().value_or(-1) : -1;
@@ -31,14 +31,14 @@ Answer answerOfStatus(veltra_status status, const char* description) {
   auto answer = std::make_unique<veltra_reply>();
   answer->status = status;
   if (status != VELTRA_OK) {
-    answer->error =
-        ReportingError{kVeltraErrorDomain, -1, description ? description : veltra_status_text(status)};
+    answer->error = wire::ReportingError{wire::kVeltraErrorDomain, -1,
+                                         description ? description : veltra_status_text(status)};
   }
   return answer;
 }
 
 Answer answerOfReply(std::string_view body) {
-  const auto parsed = parseBinaryPropertyList(body, kDaemonFrameLimits);
+  const auto parsed = parseBinaryPropertyList(body, wire::kDaemonFrameLimits);
   const Dictionary* reply = parsed ? parsed.value().asDictionary() : nullptr;
   if (!reply) return unreadable();
   auto answer = std::make_unique<veltra_reply>();
@@ -67,10 +67,11 @@ void settleUpload(veltra_reply& answer) {
   } else if (answer.status == VELTRA_OK && !answer.uploaded) {
     problem = file->problem();
   }
-  if (problem && !answer.error) answer.error = ReportingError{kVeltraErrorDomain, -1, std::move(*problem)};
+  if (problem && !answer.error)
+    answer.error = wire::ReportingError{wire::kVeltraErrorDomain, -1, std::move(*problem)};
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client
 
 veltra_status veltra_reply_status(const veltra_reply* reply) {
   return reply ? reply->status : VELTRA_INVALID;

@@ -10,20 +10,20 @@
 #include "base/value.h"
 #include "client/uploaded_file.h"
 #include "client/value_node.h"
-#include "protocol/error.h"
 #include "veltra/veltra.h"
+#include "wire/error.h"
 
 struct veltra_reply {
   veltra_status status = VELTRA_OK;
   std::optional<std::string> text;
-  veltrad::ValuePointer backends;
+  veltrad::client::ValuePointer backends;
   bool uploaded = false;
   bool removed = false;
-  std::optional<veltrad::ReportingError> error;
-  std::shared_ptr<veltrad::UploadedFile> file;  // of an upload that is not settled
+  std::optional<veltrad::wire::ReportingError> error;
+  std::shared_ptr<veltrad::client::UploadedFile> file;  // of an upload that is not settled
 };
 
-namespace veltrad {
+namespace veltrad::client {
 
 using Answer = std::unique_ptr<veltra_reply>;
 
@@ -35,6 +35,6 @@ Answer answerOfStatus(veltra_status status, const char* description = nullptr);
 // stays or was not taken. For any other answer nothing.
 void settleUpload(veltra_reply& answer);
 // {"domain", "code", "description"} as the wire carries it; what is missing or of another type is empty.
-ReportingError errorOfDictionary(const Dictionary& dictionary);
+wire::ReportingError errorOfDictionary(const Dictionary& dictionary);
 
-}  // namespace veltrad
+}  // namespace veltrad::client

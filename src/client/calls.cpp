@@ -3,18 +3,18 @@
 
 #include "base/property_list.h"
 #include "base/text.h"
-#include "ipc/frame.h"
-#include "protocol/constants.h"
-#include "protocol/limits.h"
+#include "wire/constants.h"
+#include "wire/frame.h"
+#include "wire/limits.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
 using Entries = std::vector<Dictionary::Entry>;
 
 // What the daemon reads at most, less the frame's own dictionaries around it.
-constexpr int kDeepestArgument = kMostFrameDepth - 4;
+constexpr int kDeepestArgument = wire::kMostFrameDepth - 4;
 
 bool absentOrDictionary(const veltra_value* value) {
   return !value || value->entries();
@@ -22,7 +22,7 @@ bool absentOrDictionary(const veltra_value* value) {
 
 // Before it is made: a value that cannot fit is not even copied.
 bool fits(const veltra_value* value) {
-  return !value || (value->depth <= kDeepestArgument && value->objects <= kMostCallObjects);
+  return !value || (value->depth <= kDeepestArgument && value->objects <= wire::kMostCallObjects);
 }
 
 std::string mended(const char* text) {
@@ -31,13 +31,13 @@ std::string mended(const char* text) {
 
 Value sessionInfo(const veltra_session_options& options) {
   Dictionary info;
-  if (options.has_session_id) info.set(kVeltraSessionInfoSessionID, options.session_id);
-  if (options.has_client_type) info.set(kVeltraSessionInfoClientType, options.client_type);
+  if (options.has_session_id) info.set(wire::kVeltraSessionInfoSessionID, options.session_id);
+  if (options.has_client_type) info.set(wire::kVeltraSessionInfoClientType, options.client_type);
   if (options.has_client_version) {
-    info.set(kVeltraSessionInfoClientVersion, static_cast<unsigned>(options.client_version));
+    info.set(wire::kVeltraSessionInfoClientVersion, static_cast<unsigned>(options.client_version));
   }
-  info.set(kVeltraSessionInfoRequireUserInfo, options.require_user_info);
-  info.set(kVeltraSessionInfoBatchEvent, options.batch_events);
+  info.set(wire::kVeltraSessionInfoRequireUserInfo, options.require_user_info);
+  info.set(wire::kVeltraSessionInfoBatchEvent, options.batch_events);
   return info;
 }
 
@@ -47,24 +47,24 @@ Entries identity(const veltra_session_options& options) {
   arguments.emplace_back("sessionInfo", sessionInfo(options));
   if (options.user_info || options.client_name || options.service_name) {
     Dictionary userInfo = dictionaryOfNode(options.user_info);
-    if (options.client_name) userInfo.set(kVeltraUserInfoClientName, mended(options.client_name));
-    if (options.service_name) userInfo.set(kVeltraUserInfoServiceName, mended(options.service_name));
+    if (options.client_name) userInfo.set(wire::kVeltraUserInfoClientName, mended(options.client_name));
+    if (options.service_name) userInfo.set(wire::kVeltraUserInfoServiceName, mended(options.service_name));
     arguments.emplace_back("userInfo", std::move(userInfo));
   }
   return arguments;
 }
 
-CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries arguments,
+CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries arguments,
                       std::uint8_t descriptors = 0) {
   Entries body;
   body.reserve(2);
   body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
   body.emplace_back("op", operation);
   Dictionary whole = Dictionary::fromEntries(std::move(body));
-  std::string frame = ipc::makeFrame(kind, 0, whole, descriptors);
-  if (!ipc::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
+  std::string frame = wire::makeFrame(kind, 0, whole, descriptors);
+  if (!wire::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
   // An object takes a byte at least where it stands, so that only a long frame is worth a count.
-  if (frame.size() > kMostCallObjects && objectsIn(Value(std::move(whole))) > kMostCallObjects) {
+  if (frame.size() > wire::kMostCallObjects && objectsIn(Value(std::move(whole))) > wire::kMostCallObjects) {
     return {VELTRA_TOO_LARGE, {}};
   }
   return {VELTRA_OK, std::move(frame)};
@@ -73,7 +73,7 @@ CallFrame frameOfKind(ipc::FrameKind kind, const char* operation, Entries argume
 }  // namespace
 
 CallFrame callFrame(const char* operation, Entries arguments) {
-  return frameOfKind(ipc::FrameKind::call, operation, std::move(arguments));
+  return frameOfKind(wire::FrameKind::call, operation, std::move(arguments));
 }
 
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
@@ -82,10 +82,10 @@ CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_
   if (!fits(payload)) return {VELTRA_TOO_LARGE, {}};
   Entries message;
   message.reserve(4);
-  message.emplace_back(kVeltraMessageParametersCategory, static_cast<unsigned>(category));
-  if (flag != 0) message.emplace_back(kVeltraMessageParametersFlag, flag);
-  if (payload) message.emplace_back(kVeltraMessageParametersPayload, dictionaryOfNode(payload));
-  message.emplace_back(kVeltraMessageParametersType, static_cast<unsigned>(type));
+  message.emplace_back(wire::kVeltraMessageParametersCategory, static_cast<unsigned>(category));
+  if (flag != 0) message.emplace_back(wire::kVeltraMessageParametersFlag, flag);
+  if (payload) message.emplace_back(wire::kVeltraMessageParametersPayload, dictionaryOfNode(payload));
+  message.emplace_back(wire::kVeltraMessageParametersType, static_cast<unsigned>(type));
   if (flag == 0) return callFrame(kSendMessage, std::move(message));
   Entries arguments;
   arguments.emplace_back("message", Dictionary::fromEntries(std::move(message)));
@@ -124,7 +124,7 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
 CallFrame uploadFileFrame(const char* path) {
   if (!path) return {VELTRA_INVALID, {}};
   auto file = std::make_shared<UploadedFile>(path);
-  CallFrame call = frameOfKind(ipc::FrameKind::call, kUploadFile, {{"path", toUTF8(file->absolutePath())}},
+  CallFrame call = frameOfKind(wire::FrameKind::call, kUploadFile, {{"path", toUTF8(file->absolutePath())}},
                                file->descriptor() >= 0 ? 1 : 0);
   call.file = std::move(file);
   return call;
@@ -140,7 +140,7 @@ std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
 CallFrame logDataFrame(const veltra_value* data) {
   if (!data || !data->items()) return {VELTRA_INVALID, {}};
   if (!fits(data)) return {VELTRA_TOO_LARGE, {}};
-  return frameOfKind(ipc::FrameKind::largeCall, kUploadLogData, {{"data", valueOfNode(*data)}});
+  return frameOfKind(wire::FrameKind::largeCall, kUploadLogData, {{"data", valueOfNode(*data)}});
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

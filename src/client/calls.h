@@ -12,7 +12,7 @@
 #include "client/value_node.h"
 #include "veltra/veltra.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 inline constexpr const char* kFetchStates = "fetchStatesWithUserInfo:completionHandler:";
 inline constexpr const char* kFetchDisplayURL = "fetchDisplayURL:";
@@ -55,4 +55,4 @@ CallFrame uploadFileFrame(const char* path);
 // `data` is an array; the one call whose frame may be a large one.
 CallFrame logDataFrame(const veltra_value* data);
 
-}  // namespace veltrad
+}  // namespace veltrad::client

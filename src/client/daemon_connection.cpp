@@ -13,9 +13,9 @@
 
 #include "base/property_list.h"
 #include "client/calls.h"
-#include "protocol/limits.h"
+#include "wire/limits.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
@@ -27,9 +27,9 @@ constexpr std::uint32_t kHangUps = EPOLLRDHUP | EPOLLHUP | EPOLLERR;
 constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
 
 void setCallID(std::string& frame, std::uint32_t callID) {
-  ipc::FrameHeader header = ipc::decodeFrameHeader(frame.data());
+  wire::FrameHeader header = wire::decodeFrameHeader(frame.data());
   header.callID = callID;
-  ipc::encodeFrameHeader(header, frame.data());
+  wire::encodeFrameHeader(header, frame.data());
 }
 
 }  // namespace
@@ -164,21 +164,21 @@ DaemonConnection::Received DaemonConnection::receive(int flags) {
 }
 
 bool DaemonConnection::takeFrames() {
-  ipc::Frame frame;
+  wire::Frame frame;
   for (;;) {
     switch (_frames.next(frame)) {
-      case ipc::FrameReader::Next::needMore:
+      case wire::FrameReader::Next::needMore:
         return true;
-      case ipc::FrameReader::Next::impossible:
+      case wire::FrameReader::Next::impossible:
         return false;
-      case ipc::FrameReader::Next::frame:
+      case wire::FrameReader::Next::frame:
         break;
     }
-    if (frame.header.kind == ipc::FrameKind::refusal) return false;
-    if (frame.header.kind == ipc::FrameKind::reply && frame.header.callID != 0) {
+    if (frame.header.kind == wire::FrameKind::refusal) return false;
+    if (frame.header.kind == wire::FrameKind::reply && frame.header.callID != 0) {
       _arrived.push_back({frame.header.callID, answerOfReply(frame.body), {}});
-    } else if (frame.header.kind == ipc::FrameKind::event) {
-      auto body = parseBinaryPropertyList(frame.body, kDaemonFrameLimits);
+    } else if (frame.header.kind == wire::FrameKind::event) {
+      auto body = parseBinaryPropertyList(frame.body, wire::kDaemonFrameLimits);
       const Dictionary* event = body ? body.value().asDictionary() : nullptr;
       if (event) _arrived.push_back({0, nullptr, *event});
     }
@@ -397,4 +397,4 @@ void DaemonConnection::updateInterest() {
   ::epoll_ctl(_epoll.get(), EPOLL_CTL_MOD, _socket.get(), &socketEvent);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

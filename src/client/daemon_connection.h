@@ -12,17 +12,17 @@
 #include <unordered_map>
 #include <vector>
 
+#include "base/file_descriptor.h"
 #include "base/mutex.h"
+#include "base/thread.h"
 #include "base/value.h"
 #include "client/answer.h"
 #include "client/daemon_socket.h"
 #include "client/out_frames.h"
-#include "ipc/frame.h"
-#include "ipc/thread.h"
-#include "platform/file_descriptor.h"
 #include "veltra/veltra.h"
+#include "wire/frame.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 // Events that may wait for a slow event handler; the next is dropped and counted.
 inline constexpr std::size_t kMostWaitingEvents = 4096;
@@ -120,16 +120,16 @@ class DaemonConnection {
   void wake();
 
   // Constant after construction.
-  const platform::FileDescriptor _socket;
-  platform::FileDescriptor _epoll;
-  platform::FileDescriptor _wakeUp;
+  const FileDescriptor _socket;
+  FileDescriptor _epoll;
+  FileDescriptor _wakeUp;
   const std::size_t _queueBytes;
   const EventHandler _handler;
-  ipc::Thread _thread;
+  Thread _thread;
   std::atomic<std::thread::id> _ownThread{};
 
   // The holder of the reading role only.
-  ipc::FrameReader _frames;
+  wire::FrameReader _frames;
   std::vector<Arrived> _arrived;
 
   Mutex _lock LEAF_LOCK{LockRank::leaf};
@@ -152,4 +152,4 @@ class DaemonConnection {
   veltra_statistics _counts GUARDED_BY(_lock){};
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -15,7 +15,7 @@
 #include "base/text.h"
 #include "client/answer.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
@@ -73,7 +73,7 @@ ConnectFailure connectFailure(int error, const std::string& path) {
   }
 }
 
-Result<platform::FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
+Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   if (path.size() >= sizeof address.sun_path) {
@@ -85,7 +85,7 @@ Result<platform::FileDescriptor, ConnectFailure> connectTo(const std::string& pa
             escapedForLog(path), path.size(), sizeof address.sun_path - 1)}};
   }
   std::memcpy(address.sun_path, path.data(), path.size());
-  platform::FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!made.isOpen()) return Failure{noDaemon(fmt::format("No socket could be made: {}.", errorText(errno)))};
   // Bounds the wait for a place in the listener's backlog, and the writing of the first frames.
   const timeval bound{kGreetingTimeout.count(), 0};
@@ -110,14 +110,14 @@ bool sendAll(int socket, std::string_view bytes) {
 
 enum class Came { frame, end, timeout, impossible };
 
-Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, ipc::Frame& frame) {
+Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, wire::Frame& frame) {
   for (;;) {
     switch (daemon.reader.next(frame)) {
-      case ipc::FrameReader::Next::frame:
+      case wire::FrameReader::Next::frame:
         return Came::frame;
-      case ipc::FrameReader::Next::impossible:
+      case wire::FrameReader::Next::impossible:
         return Came::impossible;
-      case ipc::FrameReader::Next::needMore:
+      case wire::FrameReader::Next::needMore:
         break;
     }
     const auto left =
@@ -133,28 +133,28 @@ Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, ipc::Frame& frame) 
 }
 
 // Absent: the daemon's hello is as it must be.
-std::optional<ConnectFailure> verdictOnGreeting(const ipc::Frame& frame, const std::string& shown) {
+std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const std::string& shown) {
   const auto parsed = parseBinaryPropertyList(frame.body);
   const Dictionary* body = parsed ? parsed.value().asDictionary() : nullptr;
-  if (frame.header.kind == ipc::FrameKind::refusal && body) {
+  if (frame.header.kind == wire::FrameKind::refusal && body) {
     const Dictionary* error = body->dictionary("error");
-    ReportingError refusal = error ? errorOfDictionary(*error) : ReportingError{};
+    wire::ReportingError refusal = error ? errorOfDictionary(*error) : wire::ReportingError{};
     if (refusal.description.empty()) {
       refusal.description = fmt::format("The daemon on {} refused the connection and gave no reason.", shown);
     }
     return ConnectFailure{VELTRA_REFUSED, std::move(refusal.description)};
   }
   const auto wire = body ? body->uint32("wire") : std::nullopt;
-  if (frame.header.kind != ipc::FrameKind::hello || !wire) {
+  if (frame.header.kind != wire::FrameKind::hello || !wire) {
     return noDaemon(
         fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
   }
-  if (*wire != ipc::kWireVersion) {
+  if (*wire != wire::kWireVersion) {
     return ConnectFailure{
         VELTRA_REFUSED,
         fmt::format("The daemon on {} speaks version {} of the wire protocol and this library {}: "
                     "install both from the same release.",
-                    shown, *wire, ipc::kWireVersion)};
+                    shown, *wire, wire::kWireVersion)};
   }
   return std::nullopt;
 }
@@ -168,13 +168,13 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
   if (!connected) return Failure{connected.error()};
   DaemonSocket daemon{std::move(connected).value(), {}};
   const std::string hello =
-      ipc::makeFrame(ipc::FrameKind::hello, 0,
-                     Dictionary{{"wire", Value(ipc::kWireVersion)}, {"library", veltra_version()}});
+      wire::makeFrame(wire::FrameKind::hello, 0,
+                      Dictionary{{"wire", Value(wire::kWireVersion)}, {"library", veltra_version()}});
   // A daemon that refuses may end the connection before all of this is written; its reason is still to be
   // read.
   (void)sendAll(daemon.socket.get(), hello + firstCalls);
   const std::string shown = escapedForLog(path);
-  ipc::Frame frame;
+  wire::Frame frame;
   switch (receiveFrame(daemon, deadline, frame)) {
     case Came::frame:
       break;
@@ -196,4 +196,4 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
   return daemon;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

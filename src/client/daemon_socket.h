@@ -5,12 +5,12 @@
 #include <chrono>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "base/result.h"
-#include "ipc/frame.h"
-#include "platform/file_descriptor.h"
 #include "veltra/veltra.h"
+#include "wire/frame.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 // How long a daemon may take to accept a connection and to say hello.
 inline constexpr std::chrono::seconds kGreetingTimeout{5};
@@ -21,8 +21,8 @@ struct ConnectFailure {
 };
 
 struct DaemonSocket {
-  platform::FileDescriptor socket;  // connected, blocking, close-on-exec
-  ipc::FrameReader reader;          // holds what came after the daemon's hello
+  FileDescriptor socket;     // connected, blocking, close-on-exec
+  wire::FrameReader reader;  // holds what came after the daemon's hello
 };
 
 // Connects to `path`, says hello and sends `firstCalls` (whole frames) behind it, and waits for the daemon's
@@ -30,4 +30,4 @@ struct DaemonSocket {
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience = kGreetingTimeout);
 
-}  // namespace veltrad
+}  // namespace veltrad::client

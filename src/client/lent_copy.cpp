@@ -10,14 +10,14 @@
 #include <cstdlib>
 #include <string>
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
 constexpr std::size_t kPieceBytes = 64u << 10;
 
-platform::FileDescriptor inDirectory(const std::string& directory) {
-  platform::FileDescriptor file(::open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
+FileDescriptor inDirectory(const std::string& directory) {
+  FileDescriptor file(::open(directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
   if (file.isOpen() || (errno != EOPNOTSUPP && errno != EISDIR && errno != EINVAL)) return file;
   std::string name = directory + "/veltra-XXXXXX";
   file.reset(::mkostemp(name.data(), O_CLOEXEC));
@@ -25,9 +25,9 @@ platform::FileDescriptor inDirectory(const std::string& directory) {
   return file;
 }
 
-platform::FileDescriptor placeFor(off_t size) {
+FileDescriptor placeFor(off_t size) {
   if (size <= kMostCopiedInMemory)
-    return platform::FileDescriptor(::memfd_create("veltra-upload", MFD_CLOEXEC | MFD_ALLOW_SEALING));
+    return FileDescriptor(::memfd_create("veltra-upload", MFD_CLOEXEC | MFD_ALLOW_SEALING));
   const char* chosen = ::secure_getenv("TMPDIR");
   return inDirectory(chosen && *chosen ? chosen : "/tmp");
 }
@@ -58,8 +58,8 @@ bool copy(int from, int to, off_t size) {
 
 }  // namespace
 
-platform::FileDescriptor copyOfFile(int file, off_t size) {
-  platform::FileDescriptor place = placeFor(size);
+FileDescriptor copyOfFile(int file, off_t size) {
+  FileDescriptor place = placeFor(size);
   if (!place.isOpen()) return place;
   if (!copy(file, place.get(), size)) {
     const int error = errno;
@@ -72,4 +72,4 @@ platform::FileDescriptor copyOfFile(int file, off_t size) {
   return place;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -8,9 +8,9 @@
 #include <cerrno>
 #include <cstring>
 
-#include "ipc/frame.h"
+#include "wire/frame.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
@@ -35,9 +35,9 @@ ssize_t sendWithDescriptor(int socket, msghdr message, int descriptor) {
 
 // The daemon then says that it has got no file.
 void announceNoDescriptor(std::string& frame) {
-  ipc::FrameHeader header = ipc::decodeFrameHeader(frame.data());
+  wire::FrameHeader header = wire::decodeFrameHeader(frame.data());
   header.descriptors = 0;
-  ipc::encodeFrameHeader(header, frame.data());
+  wire::encodeFrameHeader(header, frame.data());
 }
 
 }  // namespace
@@ -122,4 +122,4 @@ std::uint64_t OutFrames::clear() {
   return lost;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

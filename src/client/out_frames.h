@@ -11,7 +11,7 @@
 
 #include "client/uploaded_file.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 // Job: keeps whole frames in order and writes them without blocking. A frame counts as waiting until its last
 // byte was taken.
@@ -52,4 +52,4 @@ class OutFrames {
   std::uint64_t _written = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -5,14 +5,16 @@
 #include "client/calls.h"
 #include "client/daemon_connection.h"
 #include "client/daemon_socket.h"
-#include "platform/root.h"
+#include "wire/socket_path.h"
 
-using veltrad::Answer;
-using veltrad::CallFrame;
+namespace client = veltrad::client;
+
+using client::Answer;
+using client::CallFrame;
 using veltrad::Dictionary;
 
 struct veltra_session {
-  std::shared_ptr<veltrad::DaemonConnection> connection;
+  std::shared_ptr<client::DaemonConnection> connection;
 };
 
 namespace {
@@ -26,8 +28,8 @@ veltra_session* failed(veltra_status why, const std::string& text, veltra_status
   return nullptr;
 }
 
-veltrad::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_callback callback,
-                                                           void* context) {
+client::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_callback callback,
+                                                          void* context) {
   if (!callback) return nullptr;
   return [callback, context](const Dictionary& event) {
     const std::string* operation = event.string("op");
@@ -36,39 +38,39 @@ veltrad::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_ca
     const Dictionary arguments = given ? *given : Dictionary{};
     const Dictionary* sessionInfo = arguments.dictionary("sessionInfo");
     const Dictionary* payload = arguments.dictionary("payload");
-    const auto infoNode = sessionInfo ? veltrad::nodeOfDictionary(*sessionInfo) : nullptr;
-    const auto payloadNode = payload ? veltrad::nodeOfDictionary(*payload) : nullptr;
+    const auto infoNode = sessionInfo ? client::nodeOfDictionary(*sessionInfo) : nullptr;
+    const auto payloadNode = payload ? client::nodeOfDictionary(*payload) : nullptr;
     callback(context, infoNode.get(), arguments.real("timestamp").value_or(0),
              arguments.uint16("category").value_or(0), arguments.uint16("type").value_or(0),
              payloadNode.get());
   };
 }
 
-veltra_status send(veltra_session* session, CallFrame call, veltra_callback callback, void* context) {
+veltra_status send(veltra_session* session, client::CallFrame call, veltra_callback callback, void* context) {
   if (!session) return VELTRA_INVALID;
   if (call.status != VELTRA_OK) return call.status;
   return session->connection->send(std::move(call.frame), callback, context, std::move(call.file));
 }
 
-veltra_status sendAndWait(veltra_session* session, CallFrame call, veltra_reply** reply) {
+veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltra_reply** reply) {
   const veltra_status status = session ? call.status : VELTRA_INVALID;
-  Answer answer;
+  client::Answer answer;
   if (status == VELTRA_OK) {
     const auto connection = session->connection;  // outlasts a close() that ends this call
     answer = connection->sendAndWait(std::move(call.frame), std::move(call.file));
-    veltrad::settleUpload(*answer);
+    client::settleUpload(*answer);
   } else {
-    answer = veltrad::answerOfStatus(status);
+    answer = client::answerOfStatus(status);
   }
   const veltra_status result = answer->status;
   if (reply) *reply = answer.release();
   return result;
 }
 
-CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
-                  const veltra_value* payload) {
+client::CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
+                          const veltra_value* payload) {
   if (!who || who->size < sizeof *who) return {VELTRA_INVALID, {}};
-  return veltrad::oneShotFrame(*who, category, type, payload);
+  return client::oneShotFrame(*who, category, type, payload);
 }
 
 }  // namespace
@@ -88,7 +90,7 @@ veltra_session* veltra_session_create(const veltra_session_options* options, vel
                   "The session's options were not set up: call veltra_session_options_init first.", status,
                   error);
   }
-  const CallFrame description = veltrad::sessionInfoFrame(*options);
+  const client::CallFrame description = client::sessionInfoFrame(*options);
   if (description.status != VELTRA_OK) {
     return failed(description.status,
                   description.status == VELTRA_TOO_LARGE
@@ -96,12 +98,13 @@ veltra_session* veltra_session_create(const veltra_session_options* options, vel
                       : "The user info is no dictionary.",
                   status, error);
   }
-  const auto root = options->root && *options->root ? veltrad::platform::Root(options->root)
-                                                    : veltrad::platform::Root::fromEnvironment();
-  auto reached = veltrad::reachDaemon(root.socketPath(), options->undescribed ? "" : description.frame);
+  const std::string root =
+      options->root && *options->root ? options->root : veltrad::wire::rootFromEnvironment();
+  auto reached = client::reachDaemon(veltrad::wire::socketPathUnder(root),
+                                     options->undescribed ? "" : description.frame);
   if (!reached) return failed(reached.error().status, reached.error().text, status, error);
   std::string text;
-  auto connection = veltrad::DaemonConnection::make(
+  auto connection = client::DaemonConnection::make(
       std::move(reached).value(), options->queue_bytes ? options->queue_bytes : kDefaultQueueBytes,
       aggregationHandler(options->aggregated, options->aggregated_context), text);
   if (!connection) return failed(VELTRA_NO_DAEMON, text, status, error);
@@ -113,37 +116,35 @@ void veltra_free(char* text) {
 }
 
 veltra_status veltra_session_start(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, veltrad::callFrame(veltrad::kStartConfig), callback, context);
+  return send(session, client::callFrame(client::kStartConfig), callback, context);
 }
 
 veltra_status veltra_session_start_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, veltrad::callFrame(veltrad::kStartConfig), reply);
+  return sendAndWait(session, client::callFrame(client::kStartConfig), reply);
 }
 
 veltra_status veltra_session_send(veltra_session* session, uint16_t category, uint16_t type,
                                   const veltra_value* payload, uint32_t flag, veltra_callback callback,
                                   void* context) {
-  return send(session, veltrad::messageFrame(category, type, payload, flag), callback, context);
+  return send(session, client::messageFrame(category, type, payload, flag), callback, context);
 }
 
 veltra_status veltra_session_send_wait(veltra_session* session, uint16_t category, uint16_t type,
                                        const veltra_value* payload, uint32_t flag, veltra_reply** reply) {
-  return sendAndWait(session, veltrad::messageFrame(category, type, payload, flag), reply);
+  return sendAndWait(session, client::messageFrame(category, type, payload, flag), reply);
 }
 
 veltra_status veltra_session_send_dictionary(veltra_session* session, const veltra_value* message,
                                              veltra_callback callback, void* context) {
-  return send(
-      session,
-      veltrad::dictionaryFrame(veltrad::kSendDictionary, "message", message, veltrad::Missing::invalid),
-      callback, context);
+  return send(session,
+              client::dictionaryFrame(client::kSendDictionary, "message", message, client::Missing::invalid),
+              callback, context);
 }
 
 veltra_status veltra_session_send_dictionary_wait(veltra_session* session, const veltra_value* message,
                                                   veltra_reply** reply) {
   return sendAndWait(
-      session,
-      veltrad::dictionaryFrame(veltrad::kSendDictionary, "message", message, veltrad::Missing::invalid),
+      session, client::dictionaryFrame(client::kSendDictionary, "message", message, client::Missing::invalid),
       reply);
 }
 
@@ -160,63 +161,61 @@ veltra_status veltra_session_send_one_shot_wait(veltra_session* session, const v
 }
 
 veltra_status veltra_session_flush(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, veltrad::callFrame(veltrad::kFlushMessages), callback, context);
+  return send(session, client::callFrame(client::kFlushMessages), callback, context);
 }
 
 veltra_status veltra_session_flush_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, veltrad::callFrame(veltrad::kFlushMessages), reply);
+  return sendAndWait(session, client::callFrame(client::kFlushMessages), reply);
 }
 
 veltra_status veltra_session_upload_file(veltra_session* session, const char* path, veltra_callback callback,
                                          void* context) {
-  return send(session, veltrad::uploadFileFrame(path), callback, context);
+  return send(session, client::uploadFileFrame(path), callback, context);
 }
 
 veltra_status veltra_session_upload_file_wait(veltra_session* session, const char* path,
                                               veltra_reply** reply) {
-  return sendAndWait(session, veltrad::uploadFileFrame(path), reply);
+  return sendAndWait(session, client::uploadFileFrame(path), reply);
 }
 
 veltra_status veltra_session_upload_log_data(veltra_session* session, const veltra_value* data,
                                              veltra_callback callback, void* context) {
-  return send(session, veltrad::logDataFrame(data), callback, context);
+  return send(session, client::logDataFrame(data), callback, context);
 }
 
 veltra_status veltra_session_upload_log_data_wait(veltra_session* session, const veltra_value* data,
                                                   veltra_reply** reply) {
-  return sendAndWait(session, veltrad::logDataFrame(data), reply);
+  return sendAndWait(session, client::logDataFrame(data), reply);
 }
 
 veltra_status veltra_session_states(veltra_session* session, const veltra_value* user_info,
                                     veltra_callback callback, void* context) {
-  return send(
-      session,
-      veltrad::dictionaryFrame(veltrad::kFetchStates, "userInfo", user_info, veltrad::Missing::allowed),
-      callback, context);
+  return send(session,
+              client::dictionaryFrame(client::kFetchStates, "userInfo", user_info, client::Missing::allowed),
+              callback, context);
 }
 
 veltra_status veltra_session_states_wait(veltra_session* session, const veltra_value* user_info,
                                          veltra_reply** reply) {
   return sendAndWait(
-      session,
-      veltrad::dictionaryFrame(veltrad::kFetchStates, "userInfo", user_info, veltrad::Missing::allowed),
+      session, client::dictionaryFrame(client::kFetchStates, "userInfo", user_info, client::Missing::allowed),
       reply);
 }
 
 veltra_status veltra_session_display_url(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, veltrad::callFrame(veltrad::kFetchDisplayURL), callback, context);
+  return send(session, client::callFrame(client::kFetchDisplayURL), callback, context);
 }
 
 veltra_status veltra_session_display_url_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, veltrad::callFrame(veltrad::kFetchDisplayURL), reply);
+  return sendAndWait(session, client::callFrame(client::kFetchDisplayURL), reply);
 }
 
 veltra_status veltra_session_finish(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, veltrad::callFrame(veltrad::kFinishSession), callback, context);
+  return send(session, client::callFrame(client::kFinishSession), callback, context);
 }
 
 veltra_status veltra_session_finish_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, veltrad::callFrame(veltrad::kFinishSession), reply);
+  return sendAndWait(session, client::callFrame(client::kFinishSession), reply);
 }
 
 void veltra_session_statistics(veltra_session* session, veltra_statistics* statistics) {

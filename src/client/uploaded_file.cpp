@@ -13,9 +13,9 @@
 
 #include "base/text.h"
 #include "client/lent_copy.h"
-#include "platform/file_origin.h"
+#include "wire/file_origin.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 namespace {
 
@@ -103,8 +103,8 @@ void UploadedFile::open() {
 }
 
 void UploadedFile::copyIfServedByOthers() {
-  using Kind = platform::FileOrigin::Kind;
-  const auto origin = platform::FileOrigin::of(_file.get(), 0);
+  using Kind = wire::FileOrigin::Kind;
+  const auto origin = wire::FileOrigin::of(_file.get(), 0);
   if (origin.kind == Kind::local) return;
   // What is stacked the daemon takes, if it sees the same mounts: it is worth a copy in memory alone.
   if (origin.kind == Kind::stacked && _facts.st_size > kMostCopiedInMemory) return;
@@ -165,4 +165,4 @@ std::string UploadedFile::failed(const std::string& what, int error) const {
                      std::error_code(error, std::generic_category()).message());
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -6,9 +6,9 @@
 #include <optional>
 #include <string>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
-namespace veltrad {
+namespace veltrad::client {
 
 // Made by the caller of an upload, asked under its connection's lock, settled by the thread that takes the
 // answer. Holds the file and its directory open, so that neither another working directory nor a number used
@@ -44,13 +44,13 @@ class UploadedFile {
   // Constant after construction.
   std::string _absolutePath;
   std::string _name;  // in its directory
-  platform::FileDescriptor _directory;
-  platform::FileDescriptor _file;
-  platform::FileDescriptor _copy;
+  FileDescriptor _directory;
+  FileDescriptor _file;
+  FileDescriptor _copy;
   struct stat _facts {};
   std::optional<std::string> _problem;
 
   bool _removalAsked = false;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -36,7 +36,7 @@ const veltra_value::Index& veltra_value::index() const {
 }
 
 bool veltra_value::admit(veltra_value* part) {
-  if (isPart.load(std::memory_order_relaxed) || part == this || part->depth >= veltrad::kDeepestValue)
+  if (isPart.load(std::memory_order_relaxed) || part == this || part->depth >= veltrad::client::kDeepestValue)
     return false;
   part->isPart.store(true, std::memory_order_relaxed);
   if (part->depth + 1 > depth) depth = part->depth + 1;
@@ -63,7 +63,7 @@ bool veltra_value::set(std::string key, veltra_value* part) {
   return true;
 }
 
-namespace veltrad {
+namespace veltrad::client {
 
 ValuePointer nodeOfDictionary(const Dictionary& dictionary) {
   ValuePointer node(new veltra_value(veltra_value::Entries{}));
@@ -103,4 +103,4 @@ Value valueOfNode(const veltra_value& node) {
   return array;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -45,7 +45,7 @@ struct veltra_value {
   mutable std::atomic<const Index*> madeIndex{nullptr};
 };
 
-namespace veltrad {
+namespace veltrad::client {
 
 // No value nests deeper, so every walk over one may recurse.
 inline constexpr int kDeepestValue = 64;
@@ -62,4 +62,4 @@ Value valueOfNode(const veltra_value& node);
 // Empty for anything but a dictionary.
 Dictionary dictionaryOfNode(const veltra_value* node);
 
-}  // namespace veltrad
+}  // namespace veltrad::client

@@ -3,7 +3,7 @@
 
 #include <array>
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 constexpr std::array<const char*, kVeltraClientTypeCount> kStorebagNames = {
@@ -37,4 +37,4 @@ const char* sectionNameForEnvironment(std::uint32_t environment) {
   return entry(kSectionNames, environment);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

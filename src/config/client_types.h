@@ -3,7 +3,7 @@
 
 #include <cstdint>
 
-namespace veltrad {
+namespace veltrad::config {
 
 // Client types (also called component types) are 0 to kVeltraClientTypeCount - 1.
 inline constexpr std::int32_t kVeltraClientTypeCount = 18;
@@ -19,4 +19,4 @@ const char* senderCodeForComponentType(std::int32_t componentType);
 // other.
 const char* sectionNameForEnvironment(std::uint32_t environment);
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -5,13 +5,13 @@
 #include <algorithm>
 #include <utility>
 
-#include "base/property_list.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
 #include "support/device_identity.h"
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 constexpr std::uint32_t kEnvironmentCount = 5;
@@ -38,7 +38,7 @@ std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::
       logWarning("storebagServerURL: %s; using the built-in hosts", bytes.error().description.c_str());
     return Dictionary();
   }
-  const auto list = parsePropertyList(bytes.value());
+  const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
   if (dictionary == nullptr) {
     logWarning("storebagServerURL: %s: %s; using the built-in hosts", path.c_str(),
@@ -50,7 +50,7 @@ std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::
 
 }  // namespace
 
-ProcessSettings::ProcessSettings(platform::Preferences& preferences, DeviceIdentity& device,
+ProcessSettings::ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
                                  platform::FileStore& files, std::string deploymentPath)
     : _preferences(preferences), _device(device), _files(files), _deploymentPath(std::move(deploymentPath)) {}
 
@@ -122,4 +122,4 @@ std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   return *host;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

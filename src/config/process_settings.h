@@ -7,13 +7,16 @@
 
 #include "base/mutex.h"
 
-namespace veltrad {
-
-class DeviceIdentity;
-namespace platform {
+namespace veltrad::platform {
 class FileStore;
 class Preferences;
-}  // namespace platform
+}  // namespace veltrad::platform
+
+namespace veltrad::support {
+class DeviceIdentity;
+}  // namespace veltrad::support
+
+namespace veltrad::config {
 
 // Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
 // the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
@@ -22,8 +25,8 @@ class ProcessSettings {
  public:
   // `deploymentPath`: a property list with the texts "internalStorebagHost" and "publicStorebagHost", each a
   // host name with an optional port; example hosts stand in for what is missing.
-  ProcessSettings(platform::Preferences& preferences, DeviceIdentity& device, platform::FileStore& files,
-                  std::string deploymentPath);
+  ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
+                  platform::FileStore& files, std::string deploymentPath);
 
   // 0 to 4; 0 names no section of a storebag.
   std::optional<std::uint32_t> currentEnvironment();
@@ -43,7 +46,7 @@ class ProcessSettings {
 
   // Constant after construction.
   platform::Preferences& _preferences;
-  DeviceIdentity& _device;
+  support::DeviceIdentity& _device;
   platform::FileStore& _files;
   const std::string _deploymentPath;
 
@@ -52,4 +55,4 @@ class ProcessSettings {
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::config

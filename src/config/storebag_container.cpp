@@ -2,8 +2,9 @@
 #include "config/storebag_container.h"
 
 #include "base/base64.h"
+#include "formats/property_list.h"
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 std::optional<std::string> textUnder(const Dictionary& dictionary, std::string_view key) {
@@ -14,7 +15,7 @@ std::optional<std::string> textUnder(const Dictionary& dictionary, std::string_v
 }  // namespace
 
 Result<StorebagContainer, PropertyListError> parseStorebagContainer(std::string_view bytes) {
-  const auto list = parsePropertyList(bytes, kStorebagContainerLimits);
+  const auto list = formats::parsePropertyList(bytes, kStorebagContainerLimits);
   if (!list) return Failure{list.error()};
   const Dictionary* dictionary = list.value().asDictionary();
   if (dictionary == nullptr) return StorebagContainer{};
@@ -31,9 +32,9 @@ std::optional<SignedStorebag> decodeStorebagContainer(const StorebagContainer& c
 }
 
 std::optional<Dictionary> parseStorebagBag(std::string_view bag) {
-  const auto list = parsePropertyList(bag, kStorebagBagLimits);
+  const auto list = formats::parsePropertyList(bag, kStorebagBagLimits);
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
   return dictionary != nullptr ? std::optional(*dictionary) : std::nullopt;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -10,7 +10,7 @@
 #include "base/result.h"
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::config {
 
 // Storebags are some kilobytes. The container is parsed before it is trusted, so its bounds keep whatever
 // bytes a server sends within 100 ms of CPU and 16 MiB of memory; it needs two texts and has room for a few
@@ -47,4 +47,4 @@ std::optional<SignedStorebag> decodeStorebagContainer(const StorebagContainer& c
 // The storebag in bag bytes that have been verified; nothing when they are no dictionary within the bounds.
 std::optional<Dictionary> parseStorebagBag(std::string_view bag);
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -9,11 +9,11 @@
 #include "config/process_settings.h"
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
-#include "platform/http_client.h"
+#include "http/http_client.h"
 #include "platform/log.h"
-#include "protocol/veltra.h"
+#include "support/veltra.h"
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 constexpr std::chrono::milliseconds kStorebagTimeout{15'000};
@@ -33,10 +33,10 @@ std::int32_t leadingInteger(std::string_view text) {
   return static_cast<std::int32_t>(negative ? -number : std::min(number, kMost));
 }
 
-platform::HTTPRequest requestForStorebag(std::string url, const std::optional<std::string>* lastModified) {
-  platform::HTTPRequest request;
-  request.method = platform::HTTPRequest::Method::get;
-  request.lane = platform::HTTPRequest::Lane::storebag;
+http::HTTPRequest requestForStorebag(std::string url, const std::optional<std::string>* lastModified) {
+  http::HTTPRequest request;
+  request.method = http::HTTPRequest::Method::get;
+  request.lane = http::HTTPRequest::Lane::storebag;
   request.url = std::move(url);
   request.timeout = kStorebagTimeout;
   request.mostResponseBytes = kStorebagMostContainerBytes;
@@ -49,7 +49,7 @@ platform::HTTPRequest requestForStorebag(std::string url, const std::optional<st
 
 // True when the server says that the cached storebag is current; otherwise the slot has taken the answer's
 // text.
-bool isNotModified(const platform::HTTPResponse& response, std::optional<std::string>& lastModified) {
+bool isNotModified(const http::HTTPResponse& response, std::optional<std::string>& lastModified) {
   const std::optional<std::string_view> header = response.header("Last-Modified");
   if (!header) return false;
   if (response.body.empty() && lastModified) {
@@ -65,7 +65,7 @@ bool isNotModified(const platform::HTTPResponse& response, std::optional<std::st
 
 namespace {
 // All lines of the header as one.
-std::optional<std::string> cacheControlOf(const platform::HTTPResponse& response) {
+std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   std::optional<std::string> all;
   for (const auto& [name, value] : response.headers) {
     if (equalIgnoringCase(name, "Cache-Control")) all = all ? *all + ", " + value : value;
@@ -95,8 +95,8 @@ Dictionary defaultStorebag() {
                     {"refresh_cycle", 3600}};
 }
 
-StorebagDownload::StorebagDownload(platform::HTTPClient& http, ProcessSettings& settings,
-                                   const Veltra& veltra)
+StorebagDownload::StorebagDownload(http::HTTPClient& http, ProcessSettings& settings,
+                                   const support::Veltra& veltra)
     : _http(http), _settings(settings), _veltra(veltra) {}
 
 std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::string& name,
@@ -107,13 +107,13 @@ std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::str
   const auto version = _veltra.statedVersion();
   if (!server || !version) {
     const std::string why = version ? "its address cannot be read just now" : version.error().description;
-    return withoutAnswer(name, "(null)", {platform::HTTPError::Kind::shortage, why}, maxAge, attempted);
+    return withoutAnswer(name, "(null)", {http::HTTPError::Kind::shortage, why}, maxAge, attempted);
   }
   const std::string url = *server + "/" + name + "?version=" + version.value();
   logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
-  const platform::HTTPResult answer = _http.perform(requestForStorebag(url, lastModified));
+  const http::HTTPResult answer = _http.perform(requestForStorebag(url, lastModified));
   if (!answer) return withoutAnswer(name, url, answer.error(), maxAge, attempted);
-  const platform::HTTPResponse& response = answer.value();
+  const http::HTTPResponse& response = answer.value();
   maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   if (lastModified != nullptr && isNotModified(response, *lastModified)) {
     notModified = true;
@@ -123,9 +123,9 @@ std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::str
 }
 
 std::optional<Dictionary> StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
-                                                          const platform::HTTPError& error,
-                                                          std::int32_t& maxAge, bool& attempted) const {
-  using Kind = platform::HTTPError::Kind;
+                                                          const http::HTTPError& error, std::int32_t& maxAge,
+                                                          bool& attempted) const {
+  using Kind = http::HTTPError::Kind;
   if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
     maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
@@ -164,4 +164,4 @@ std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view bo
   return parseStorebagBag(decoded->bag);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

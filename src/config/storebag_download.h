@@ -9,15 +9,19 @@
 
 #include "base/value.h"
 
-namespace veltrad {
-
-class ProcessSettings;
-class Veltra;
-namespace platform {
+namespace veltrad::http {
 class HTTPClient;
 struct HTTPError;
 struct HTTPResponse;
-}  // namespace platform
+}  // namespace veltrad::http
+
+namespace veltrad::support {
+class Veltra;
+}  // namespace veltrad::support
+
+namespace veltrad::config {
+
+class ProcessSettings;
 
 // The lifetime in seconds that a "Cache-Control" value allows: the leading integer of the component after the
 // first "max-age", components ending at every "=" and every space; kept within 32 bits. 86,400 where there is
@@ -30,7 +34,7 @@ Dictionary defaultStorebag();
 // Keeps no state between calls; any number of threads at once. What the constructor takes must outlive it.
 class StorebagDownload {
  public:
-  StorebagDownload(platform::HTTPClient& http, ProcessSettings& settings, const Veltra& veltra);
+  StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
   // The verified storebag, or nothing. `maxAge` (seconds) is written on every path that got an answer;
   // `notModified` becomes true when the server says that the cached storebag is current; `lastModified` (or
@@ -44,13 +48,13 @@ class StorebagDownload {
 
  private:
   std::optional<Dictionary> withoutAnswer(const std::string& name, const std::string& server,
-                                          const platform::HTTPError& error, std::int32_t& maxAge,
+                                          const http::HTTPError& error, std::int32_t& maxAge,
                                           bool& attempted) const;
   std::optional<Dictionary> verifiedStorebag(std::string_view body, bool& attempted) const;
 
-  platform::HTTPClient& _http;
+  http::HTTPClient& _http;
   ProcessSettings& _settings;
-  const Veltra& _veltra;
+  const support::Veltra& _veltra;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::config

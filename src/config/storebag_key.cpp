@@ -10,7 +10,7 @@
 #include <openssl/provider.h>
 #include <openssl/rsa.h>
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 template <auto Free>
@@ -112,4 +112,4 @@ bool verifySignature(std::string_view publicKeyDER, std::string_view bag, std::s
   return key && key->verifies(bag, signature);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string_view>
 
-namespace veltrad {
+namespace veltrad::config {
 
 // RSA, PKCS#1 v1.5 over SHA-1 (RFC 8017, 8.2.2), in a library context of its own: no configuration file and
 // no provider of the host changes what is accepted.
@@ -39,4 +39,4 @@ class StorebagKey {
 // False also when the key is unusable.
 bool verifySignature(std::string_view publicKeyDER, std::string_view bag, std::string_view signature);
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -8,7 +8,7 @@
 #include "config/process_settings.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 constexpr std::uint32_t kSeedEnvironment = 3;
@@ -31,8 +31,8 @@ std::optional<std::int32_t> refreshCycleOf(const Dictionary& storebag) {
 
 }  // namespace
 
-StorebagSections::StorebagSections(platform::HTTPClient& http, ProcessSettings& settings,
-                                   const Veltra& veltra)
+StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
+                                   const support::Veltra& veltra)
     : _settings(settings), _download(http, settings, veltra) {}
 
 std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClientType(
@@ -75,4 +75,4 @@ std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClient
   return *section;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

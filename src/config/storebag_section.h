@@ -4,7 +4,7 @@
 #include "config/storebag_download.h"
 #include "config/storebag_source.h"
 
-namespace veltrad {
+namespace veltrad::config {
 
 // The real source: downloads the storebag at each call. Keeps no state; any number of threads at once. What
 // the constructor takes must outlive it.
@@ -13,7 +13,7 @@ class StorebagSections final : public StorebagSource {
   // A cached copy stays fresh at most this long on the storebag's own word ("refresh_cycle").
   static constexpr std::int32_t kMostRefreshCycleSeconds = 86'400;
 
-  StorebagSections(platform::HTTPClient& http, ProcessSettings& settings, const Veltra& veltra);
+  StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
   std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
@@ -24,4 +24,4 @@ class StorebagSections final : public StorebagSource {
   StorebagDownload _download;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::config

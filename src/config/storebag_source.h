@@ -7,7 +7,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::config {
 
 class StorebagSource {
  public:
@@ -23,4 +23,4 @@ class StorebagSource {
       std::optional<std::string>* lastModified, bool& attempted) = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::config

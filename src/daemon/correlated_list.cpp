@@ -3,7 +3,7 @@
 
 #include <utility>
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 void CorrelatedList::join(const SessionPointer& session) {
   const Place place{session->getSessionHierarchy(), _nextJoined};
@@ -12,14 +12,14 @@ void CorrelatedList::join(const SessionPointer& session) {
   _levels[place.level].emplace(place.joined, session);
 }
 
-void CorrelatedList::leave(const VeltradSession& session) {
+void CorrelatedList::leave(const session::VeltradSession& session) {
   const auto at = _places.find(&session);
   if (at == _places.end()) return;
   const SessionPointer kept = take(at->second);  // may be the last reference
   _places.erase(at);
 }
 
-void CorrelatedList::refreshLevel(const VeltradSession& session) {
+void CorrelatedList::refreshLevel(const session::VeltradSession& session) {
   const auto at = _places.find(&session);
   const std::int32_t level = session.getSessionHierarchy();
   if (at == _places.end() || at->second.level == level) return;
@@ -76,4 +76,4 @@ std::vector<CorrelatedList::SessionPointer> CorrelatedList::below(std::int32_t h
   return sessions;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -11,7 +11,7 @@
 
 #include "session/veltrad_session.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 // What the sessions above a level are called together: their ID strings from the root to the parent, joined
 // by
@@ -25,12 +25,12 @@ struct AncestorIDs {
 // the registry refreshes it whenever the session's states were recomputed.
 class CorrelatedList {
  public:
-  using SessionPointer = std::shared_ptr<VeltradSession>;
+  using SessionPointer = std::shared_ptr<session::VeltradSession>;
 
   void join(const SessionPointer& session);  // at the end, unless it is in already
-  void leave(const VeltradSession& session);
-  void refreshLevel(const VeltradSession& session);
-  bool contains(const VeltradSession& session) const { return _places.count(&session) > 0; }
+  void leave(const session::VeltradSession& session);
+  void refreshLevel(const session::VeltradSession& session);
+  bool contains(const session::VeltradSession& session) const { return _places.count(&session) > 0; }
   bool empty() const { return _places.empty(); }
 
   // The first that joined of those with this hierarchy number, or null.
@@ -52,8 +52,8 @@ class CorrelatedList {
   SessionPointer take(const Place& place);
 
   std::uint64_t _nextJoined = 0;
-  std::unordered_map<const VeltradSession*, Place> _places;
+  std::unordered_map<const session::VeltradSession*, Place> _places;
   std::map<std::int64_t, Level> _levels;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -1,9 +1,9 @@
 // Which room gets which services.
 #include "daemon/daemon.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
-Daemon::Daemon(platform::Services& services)
+Daemon::Daemon(Services& services)
     : _library(services.files, services.preferences, services.root),
       _device(services.device),
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
@@ -16,4 +16,4 @@ Daemon::Daemon(platform::Services& services)
               services.counters, _flushes, _messageLog},
              _storebags, services.transaction) {}
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -7,32 +7,32 @@
 #include "backends/backend_factory.h"
 #include "config/process_settings.h"
 #include "config/storebag_section.h"
+#include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
-#include "platform/services.h"
-#include "protocol/veltra.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
+#include "support/veltra.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 // Everything between the platform's services and the listener. The services outlive it; it outlives the
 // listener.
 class Daemon {
  public:
-  explicit Daemon(platform::Services& services);
+  explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
-  StandardBackendFactory& backends() { return _factory; }
+  backends::StandardBackendFactory& backends() { return _factory; }
 
  private:
-  Veltra _library;
-  DeviceIdentity _device;
-  ProcessSettings _settings;
-  MessageLogFile _messageLog;
-  FlushCounters _flushes;
-  StandardBackendFactory _factory;
-  StorebagSections _storebags;
+  support::Veltra _library;
+  support::DeviceIdentity _device;
+  config::ProcessSettings _settings;
+  support::MessageLogFile _messageLog;
+  session::FlushCounters _flushes;
+  backends::StandardBackendFactory _factory;
+  config::StorebagSections _storebags;
   VeltradAgent _agent;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

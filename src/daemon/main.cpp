@@ -75,7 +75,7 @@ void enterSandbox(const platform::Root& root) {
   }
 }
 
-std::optional<ipc::ServiceSocket> openSocket(platform::Services& services) {
+std::optional<ipc::ServiceSocket> openSocket(daemon::Services& services) {
   const auto handedOver = services.serviceManager.handedOverSocket();
   if (!handedOver.ok()) {
     logError("main: %s", handedOver.error().c_str());
@@ -89,7 +89,7 @@ std::optional<ipc::ServiceSocket> openSocket(platform::Services& services) {
   return std::move(socket).value();
 }
 
-void serve(platform::Services& services, VeltradAgent& agent, platform::CountersFile& countersFile,
+void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
            platform::RunLoop& loop) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
@@ -106,7 +106,7 @@ void serve(platform::Services& services, VeltradAgent& agent, platform::Counters
 // The listener first, so that every session sends its stop message; then what is still to be posted or sent;
 // then what that has left for the disk, the counters last. False: something still runs, so nothing may be
 // destroyed.
-bool stop(platform::Services& services, Listener& listener, platform::CountersFile& countersFile) {
+bool stop(daemon::Services& services, ipc::Listener& listener, platform::CountersFile& countersFile) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
@@ -152,7 +152,7 @@ int main(int count, char** arguments) {
   platform::RunLoop loop;
   loop.blockSignals();
 
-  platform::Services services(platform::Root::fromEnvironment());
+  daemon::Services services(platform::Root::fromEnvironment());
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
   enterSandbox(services.root);
@@ -163,10 +163,10 @@ int main(int count, char** arguments) {
   services.writer.start();  // so that later no thread comes or goes but for clients
   platform::CountersFile countersFile(services.counters, services.files, services.writer,
                                       services.root.countersPath(), started);
-  Daemon daemon(services);
-  Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
-                     services.memory, services.root.entitlementsPath()},
-                    daemon.agent());
+  daemon::Daemon daemon(services);
+  ipc::Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
+                          services.memory, services.root.entitlementsPath()},
+                         daemon.agent());
   if (!listener.resume()) return 1;
   platform::forbidExit();
   services.serviceManager.ready();

@@ -4,10 +4,10 @@
 #include "daemon/veltrad_agent.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
-const CorrelatedList* VeltradAgent::correlatedList(const VeltradSession& session) {
-  SharedDictionary userInfo = session.userInfo();
+const CorrelatedList* VeltradAgent::correlatedList(const session::VeltradSession& session) {
+  backends::SharedDictionary userInfo = session.userInfo();
   const auto membership = _memberships.find(&session);
   const bool member = membership != _memberships.end();
   if (member && userInfo && membership->second.userInfo == userInfo) return membership->second.list;
@@ -17,8 +17,8 @@ const CorrelatedList* VeltradAgent::correlatedList(const VeltradSession& session
   return list == _correlatedSessions.end() ? nullptr : &list->second;
 }
 
-const CorrelatedList* VeltradAgent::listHolding(const VeltradSession& session, const std::string& key,
-                                                const char* operation) {
+const CorrelatedList* VeltradAgent::listHolding(const session::VeltradSession& session,
+                                                const std::string& key, const char* operation) {
   const CorrelatedList* list = correlatedList(session);
   if (!list || list->empty()) {
     logError("%s: ERROR: No sessions found for user info key %s", operation, key.c_str());
@@ -32,7 +32,8 @@ const CorrelatedList* VeltradAgent::listHolding(const VeltradSession& session, c
   return list;
 }
 
-std::optional<std::string> VeltradAgent::parentSessionIDStringForSession(const VeltradSession& session) {
+std::optional<std::string> VeltradAgent::parentSessionIDStringForSession(
+    const session::VeltradSession& session) {
   const std::int32_t hierarchy = session.getSessionHierarchy();
   if (hierarchy == 0) return std::nullopt;
   const std::string key = userInfoKeyForUserInfo(session.userInfo().get());
@@ -52,7 +53,8 @@ std::optional<std::string> VeltradAgent::parentSessionIDStringForSession(const V
   return std::move(ids.text);
 }
 
-std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const VeltradSession& session) {
+std::shared_ptr<session::VeltradSession> VeltradAgent::parentSessionForChild(
+    const session::VeltradSession& session) {
   const std::int32_t hierarchy = session.getSessionHierarchy();
   if (hierarchy == 0) return nullptr;
   const std::string key = userInfoKeyForUserInfo(session.userInfo().get());
@@ -70,23 +72,23 @@ std::shared_ptr<VeltradSession> VeltradAgent::parentSessionForChild(const Veltra
   return parent;
 }
 
-std::shared_ptr<VeltradSession> VeltradAgent::getAncestorWithAggregatorForSession(
-    const VeltradSession& session) {
+std::shared_ptr<session::VeltradSession> VeltradAgent::getAncestorWithAggregatorForSession(
+    const session::VeltradSession& session) {
   if (!session.userInfo()) return nullptr;  // which the session says
   const std::int32_t hierarchy = session.getSessionHierarchy();
   const CorrelatedList* list = hierarchy < 1 ? nullptr : correlatedList(session);
   return list ? list->topmostAggregator(hierarchy) : nullptr;
 }
 
-bool VeltradAgent::withAncestorAggregator(const VeltradSession& session,
-                                          const std::function<void(VeltradSession&)>& use) {
+bool VeltradAgent::withAncestorAggregator(const session::VeltradSession& session,
+                                          const std::function<void(session::VeltradSession&)>& use) {
   const Lock held(_lock);
   const auto ancestor = getAncestorWithAggregatorForSession(session);
   if (ancestor) use(*ancestor);
   return ancestor != nullptr;
 }
 
-void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) {
+void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<session::VeltradSession>& session) {
   std::vector<std::string> lines;
   {
     const Lock held(_lock);
@@ -95,9 +97,9 @@ void VeltradAgent::updateDownstreamSessions(const std::shared_ptr<VeltradSession
   for (const std::string& line : lines) logError("%s", line.c_str());
 }
 
-std::vector<std::string> VeltradAgent::updateDownstreamSessionsLocked(VeltradSession& session) {
+std::vector<std::string> VeltradAgent::updateDownstreamSessionsLocked(session::VeltradSession& session) {
   std::vector<std::string> lines;
-  const auto shutDown = [&lines](VeltradSession& ending) {
+  const auto shutDown = [&lines](session::VeltradSession& ending) {
     if (auto line = ending.shutdownSessionAggregation()) lines.push_back(std::move(*line));
   };
   const auto membership = _memberships.find(&session);
@@ -125,4 +127,4 @@ std::vector<std::string> VeltradAgent::updateDownstreamSessionsLocked(VeltradSes
   return lines;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

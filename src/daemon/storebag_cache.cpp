@@ -8,7 +8,7 @@
 #include "platform/clock.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
   if (!record.attempted) return CacheVerdict::fetch;
@@ -19,7 +19,7 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
 
 std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType,
                                                                        RecursiveMutex& lock) {
-  const char* name = storebagNameForClientType(clientType);
+  const char* name = config::storebagNameForClientType(clientType);
   if (!name) return fetchAndCacheStorebag(clientType, nullptr, lock);
   for (;;) {
     const auto at = _cachedStorebags.find(name);
@@ -46,7 +46,7 @@ std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int3
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {
-  const char* name = storebagNameForClientType(clientType);
+  const char* name = config::storebagNameForClientType(clientType);
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
 }
@@ -97,4 +97,4 @@ std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int3
   return record.data;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -11,12 +11,15 @@
 #include "base/mutex.h"
 #include "base/value.h"
 
-namespace veltrad {
-
+namespace veltrad::config {
 class StorebagSource;
-namespace platform {
+}  // namespace veltrad::config
+
+namespace veltrad::platform {
 class Clock;
-}
+}  // namespace veltrad::platform
+
+namespace veltrad::daemon {
 
 // What is kept of one storebag. Made at the first fetch for its name, never removed.
 struct StorebagRecord {
@@ -40,7 +43,8 @@ inline constexpr int kSecondsBetweenAttempts = 900;
 class StorebagCache {
  public:
   // Both outlive it.
-  StorebagCache(StorebagSource& source, const platform::Clock& clock) : _source(source), _clock(clock) {}
+  StorebagCache(config::StorebagSource& source, const platform::Clock& clock)
+      : _source(source), _clock(clock) {}
 
   // `lock` is the agent's, held by every caller. The section for the client type, or null: may wait for an
   // exchange, with the lock let go, so the lock is held exactly once when it is called.
@@ -53,10 +57,10 @@ class StorebagCache {
   std::shared_ptr<const Dictionary> fetchAndCacheStorebag(std::int32_t clientType, const char* name,
                                                           RecursiveMutex& lock) REQUIRES(lock);
 
-  StorebagSource& _source;
+  config::StorebagSource& _source;
   const platform::Clock& _clock;
   RecursiveCondition _fetched;
   std::map<std::string, StorebagRecord> _cachedStorebags;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -5,9 +5,9 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 // The lower-cased client name, ":", the lower-cased service name; what is missing counts as empty text.
 std::string userInfoKeyForUserInfo(const Dictionary* userInfo);
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -9,9 +9,9 @@
 #include "platform/counters.h"
 #include "platform/log.h"
 #include "platform/transaction.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::daemon {
 
 namespace {
 // Of lists that nobody is in any more: so many identities, and no long names, or clients that invent them
@@ -20,7 +20,7 @@ constexpr std::size_t kMostKeys = 4096;
 constexpr std::size_t kLongestIdleKey = 256;  // bytes
 }  // namespace
 
-VeltradAgent::VeltradAgent(const SessionServices& services, StorebagSource& source,
+VeltradAgent::VeltradAgent(const session::SessionServices& services, config::StorebagSource& source,
                            platform::Transaction& transaction)
     : _services(services), _transaction(transaction), _cachedStorebags(source, services.clock) {}
 
@@ -28,8 +28,8 @@ std::string VeltradAgent::description() const {
   return fmt::format("<VeltradAgent: {}>", fmt::ptr(this));
 }
 
-bool VeltradAgent::listener(Listener&, const std::shared_ptr<Connection>& connection) {
-  const auto entitlement = connection->valueForEntitlement(kVeltraEntitlement);
+bool VeltradAgent::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
+  const auto entitlement = connection->valueForEntitlement(wire::kVeltraEntitlement);
   // Only a boolean true passes; the number 1 does not.
   if (!entitlement || !entitlement->isBoolean() || !entitlement->toBoolean().value_or(false)) {
     logDebug(
@@ -40,7 +40,7 @@ bool VeltradAgent::listener(Listener&, const std::shared_ptr<Connection>& connec
   logDebug("listener: Accepting new Vopex connection %s as it has proper entitlement, %d(%d) connections.",
            connection->description().c_str(), static_cast<int>(sessionCount()),
            static_cast<int>(userInfoKeyCount()));
-  const auto session = VeltradSession::initWithSessionDelegate(_services, *this, connection);
+  const auto session = session::VeltradSession::initWithSessionDelegate(_services, *this, connection);
   connection->setExportedObject(session);
   addSession(session);
   const std::string name = session->description();
@@ -51,14 +51,14 @@ bool VeltradAgent::listener(Listener&, const std::shared_ptr<Connection>& connec
   return true;
 }
 
-void VeltradAgent::addSession(std::shared_ptr<VeltradSession> session) {
+void VeltradAgent::addSession(std::shared_ptr<session::VeltradSession> session) {
   const Lock held(_sessionListLock);
   if (_sessionList.empty()) _transaction.open();
   _sessionList.push_back(std::move(session));
   _sessionCount.store(_sessionList.size(), std::memory_order_relaxed);
 }
 
-void VeltradAgent::sessionInvalidated(const std::shared_ptr<VeltradSession>& session) {
+void VeltradAgent::sessionInvalidated(const std::shared_ptr<session::VeltradSession>& session) {
   logDebug("listener: Vopex connection to %s was invalidated", session->description().c_str());
   {
     const Lock held(_sessionListLock);
@@ -71,7 +71,7 @@ void VeltradAgent::sessionInvalidated(const std::shared_ptr<VeltradSession>& ses
 }
 
 // By the remembered key: the session's user info may have been taken away since it joined.
-void VeltradAgent::leaveCorrelatedList(const VeltradSession& session) {
+void VeltradAgent::leaveCorrelatedList(const session::VeltradSession& session) {
   const auto membership = _memberships.find(&session);
   if (membership == _memberships.end()) return;
   const std::string key = std::move(membership->second.key);
@@ -84,7 +84,7 @@ void VeltradAgent::leaveCorrelatedList(const VeltradSession& session) {
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
-std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const VeltradSession& session) {
+std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const session::VeltradSession& session) {
   const std::int32_t clientType = session.clientType().value_or(0);
   logDebug("storebagForSession: Retrieving storebag for session %u with client type %d", session.sessionID(),
            clientType);
@@ -92,7 +92,7 @@ std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const Veltrad
   return _cachedStorebags.storebagForClientType(clientType, _lock);
 }
 
-std::optional<std::string> VeltradAgent::storebagVersionForSession(const VeltradSession& session) {
+std::optional<std::string> VeltradAgent::storebagVersionForSession(const session::VeltradSession& session) {
   const Lock held(_lock);
   return _cachedStorebags.versionForClientType(session.clientType().value_or(0));
 }
@@ -102,8 +102,8 @@ void VeltradAgent::changeIdentity(const std::function<void()>& change) {
   change();
 }
 
-void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) {
-  const SharedDictionary userInfo = session->userInfo();
+void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<session::VeltradSession>& session) {
+  const backends::SharedDictionary userInfo = session->userInfo();
   if (!userInfo) {
     logInfo("userInfoUpdatedForSession: No user info found for session %u", session->sessionID());
     return;
@@ -119,4 +119,4 @@ void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<VeltradSessio
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::daemon

@@ -14,7 +14,7 @@ namespace veltrad::ipc {
 namespace {
 
 struct Call {
-  ClientSessionInterface& session;
+  wire::ClientSessionInterface& session;
   Dictionary& arguments;  // each is taken out where it is used
   const std::string& extensionToken;
   std::shared_ptr<PendingReply> pending;  // null: no reply is wanted
@@ -27,7 +27,7 @@ Refusal mustBe(const char* argument, const char* type) {
   return fmt::format("argument \"{}\" must be {}", argument, type);
 }
 
-OptionalDictionary takenDictionary(Call& call, std::string_view name) {
+wire::OptionalDictionary takenDictionary(Call& call, std::string_view name) {
   auto value = call.arguments.take(name);
   return value ? std::move(*value).takeDictionary() : std::nullopt;
 }
@@ -44,7 +44,7 @@ Refusal setSessionInfo(Call& call) {
   const bool described = call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
                                                      takenArray(call, "frameworksToCheck"), aggregates);
   if (!described && call.pending) {
-    call.pending->fail(makeReportingError(
+    call.pending->fail(wire::makeReportingError(
         "The session's description is more than the daemon may keep for its user; try again later.", -1));
   }
   // Nothing comes back but the word that it was done.
@@ -166,8 +166,9 @@ Result<Dictionary, std::string> dictionaryOf(Result<Value, PropertyListError> pa
 // The memory that a call's values are first thought to need: without shared objects it is enough.
 std::size_t expectedMemory(std::string_view body) {
   constexpr std::size_t kLeast = 2048, kBytesOfObject = 64;
-  const std::uint64_t objects = std::min<std::uint64_t>(declaredObjects(body).value_or(0), kMostCallObjects);
-  return std::min(kLeast + 2 * body.size() + kBytesOfObject * objects, kMostCallMemory);
+  const std::uint64_t objects =
+      std::min<std::uint64_t>(declaredObjects(body).value_or(0), wire::kMostCallObjects);
+  return std::min(kLeast + 2 * body.size() + kBytesOfObject * objects, wire::kMostCallMemory);
 }
 
 // Of a call whose values keep so much: what is copied of them and written on the way counts, too.
@@ -193,9 +194,10 @@ std::string usedUp(CallMemory& memory) {
                      memory.account->uid());
 }
 
-Result<Dictionary, std::string> decodeCall(const Frame& frame, CallMemory& memory) {
-  PropertyListLimits limits{kFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kMostCallMemory};
-  for (limits.memory = expectedMemory(frame.body);; limits.memory = kMostCallMemory) {
+Result<Dictionary, std::string> decodeCall(const wire::Frame& frame, CallMemory& memory) {
+  PropertyListLimits limits{wire::kFrameBodyLimit, wire::kMostFrameDepth, wire::kMostCallObjects,
+                            wire::kMostCallMemory};
+  for (limits.memory = expectedMemory(frame.body);; limits.memory = wire::kMostCallMemory) {
     // Nothing is held while it waits, so that calls never wait for each other in a ring.
     memory.charge.release();
     if (memory.account && !chargeCall(memory, chargeOf(limits.memory, frame.body))) {
@@ -203,17 +205,19 @@ Result<Dictionary, std::string> decodeCall(const Frame& frame, CallMemory& memor
     }
     auto parsed = parseBinaryPropertyList(frame.body, limits);
     const bool more = !parsed && parsed.error().kind == PropertyListError::Kind::overMemory &&
-                      limits.memory < kMostCallMemory;
+                      limits.memory < wire::kMostCallMemory;
     if (!more) return dictionaryOf(std::move(parsed));
   }
 }
 
 // Its bytes were charged when its header came; it does not wait for more.
-Result<Dictionary, std::string> decodeLargeCall(const Frame& frame, CallMemory& memory) {
+Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMemory& memory) {
   constexpr std::size_t kBytesOfObject = 64;
   const std::size_t bytes = memory.charge.bytes();
-  std::size_t objects = std::min<std::uint64_t>(declaredObjects(frame.body).value_or(0), kMostCallObjects);
-  PropertyListLimits limits{kLargeFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kLargeFrameBodyLimit};
+  std::size_t objects =
+      std::min<std::uint64_t>(declaredObjects(frame.body).value_or(0), wire::kMostCallObjects);
+  PropertyListLimits limits{wire::kLargeFrameBodyLimit, wire::kMostFrameDepth, wire::kMostCallObjects,
+                            wire::kLargeFrameBodyLimit};
   for (;; objects *= 2) {
     // Shared objects are found on the way: then it is read again with more.
     if (frame.refused || (memory.account && !memory.charge.resize(bytes + kBytesOfObject * objects))) {
@@ -222,17 +226,18 @@ Result<Dictionary, std::string> decodeLargeCall(const Frame& frame, CallMemory& 
     limits.memory = frame.body.size() + 2 * kBytesOfObject * (objects + 1);
     auto parsed = parseBinaryPropertyList(frame.body, limits);
     const bool more = !parsed && parsed.error().kind == PropertyListError::Kind::overMemory &&
-                      objects < 8 * kMostCallObjects;
+                      objects < 8 * wire::kMostCallObjects;
     if (!more) return dictionaryOf(std::move(parsed));
     objects = std::max<std::size_t>(objects, 64);
   }
 }
 
-Refusal runCall(const Frame& frame, ClientSessionInterface& session, const std::string& extensionToken,
-                const std::shared_ptr<PendingReply>& pending, CallMemory& memory) {
-  const FrameKind kind = frame.header.kind;
-  const bool large = kind == FrameKind::largeCall;
-  if (kind != FrameKind::call && !large) {
+Refusal runCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
+                const std::string& extensionToken, const std::shared_ptr<PendingReply>& pending,
+                CallMemory& memory) {
+  const wire::FrameKind kind = frame.header.kind;
+  const bool large = kind == wire::FrameKind::largeCall;
+  if (kind != wire::FrameKind::call && !large) {
     return fmt::format(
         "after its hello a client sends frames of kind 2 (call) and 6 (large call), not of kind {}",
         static_cast<unsigned>(kind));
@@ -256,12 +261,13 @@ Refusal runCall(const Frame& frame, ClientSessionInterface& session, const std::
 
 }  // namespace
 
-Result<Dictionary, std::string> decodeFrameBody(const Frame& frame) {
+Result<Dictionary, std::string> decodeFrameBody(const wire::Frame& frame) {
   return dictionaryOf(parseBinaryPropertyList(
-      frame.body, {kFrameBodyLimit, kMostFrameDepth, kMostCallObjects, kMostCallMemory, kMostCallMemory}));
+      frame.body, {wire::kFrameBodyLimit, wire::kMostFrameDepth, wire::kMostCallObjects,
+                   wire::kMostCallMemory, wire::kMostCallMemory}));
 }
 
-std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
+std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken) {
   std::shared_ptr<PendingReply> pending;
@@ -269,7 +275,7 @@ std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterfa
   Refusal refusal = runCall(frame, session, extensionToken, pending, memory);
   if (refusal && pending) {
     const char* what = memory.usedUp ? "The call was not run" : "The call cannot be read";
-    pending->fail(makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));
+    pending->fail(wire::makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));
   }
   return memory.usedUp ? std::nullopt : refusal;
 }

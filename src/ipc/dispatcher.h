@@ -8,10 +8,10 @@
 #include <string>
 
 #include "base/result.h"
-#include "ipc/frame.h"
 #include "ipc/out_queue.h"
 #include "platform/memory_budget.h"
-#include "protocol/client_session_interface.h"
+#include "wire/client_session_interface.h"
+#include "wire/frame.h"
 
 namespace veltrad::ipc {
 
@@ -31,11 +31,11 @@ struct CallMemory {
 // call, nothing runs and the answer says in one sentence what is wrong with it: "unknown operation "x"",
 // "argument "category" must be a number". Format: docs/wire-protocol.md. `extensionToken` is that of the file
 // that came with the frame; empty: none.
-std::optional<std::string> dispatchCall(const Frame& frame, ClientSessionInterface& session,
+std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken = {});
 
 // The dictionary in the body of a frame that is no call, or what is wrong with it.
-Result<Dictionary, std::string> decodeFrameBody(const Frame& frame);
+Result<Dictionary, std::string> decodeFrameBody(const wire::Frame& frame);
 
 }  // namespace veltrad::ipc

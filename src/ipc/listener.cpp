@@ -11,16 +11,14 @@
 #include <cstring>
 
 #include "ipc/out_queue.h"
+#include "ipc/peer.h"
 #include "ipc/socket_connection.h"
 #include "platform/log.h"
-#include "platform/peer.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::ipc {
 
 namespace {
-
-using platform::FileDescriptor;
 
 // How long the accepting thread rests when the system has no descriptor or memory left.
 constexpr int kPauseMilliseconds = 100;
@@ -32,26 +30,25 @@ FileDescriptor openSpare() {
   return FileDescriptor(::fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 0));
 }
 
-std::string refusedPeer(const platform::Peer& peer, const std::string& unit,
-                        const std::string& entitlementsPath) {
+std::string refusedPeer(const Peer& peer, const std::string& unit, const std::string& entitlementsPath) {
   return fmt::format(
       "Connection refused: this peer (uid {}, gid {}, unit {}) does not hold the entitlement \"{}\"; add a "
       "rule for it "
       "to {}.",
       peer.uid, peer.gids.empty() ? std::string("unknown") : std::to_string(peer.gids.front()), unit,
-      kVeltraEntitlement, entitlementsPath);
+      wire::kVeltraEntitlement, entitlementsPath);
 }
 
 // A peer that gets no connection is told why all the same; its queue is empty, so this cannot block.
 void refuseSocket(FileDescriptor socket, const std::string& description) {
-  const std::string frame = ipc::refusalFrame(description);
+  const std::string frame = refusalFrame(description);
   ::send(socket.get(), frame.data(), frame.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-  ipc::closeGently(std::move(socket));
+  closeGently(std::move(socket));
 }
 
 }  // namespace
 
-Listener::Listener(ipc::ListenerOptions options, ListenerDelegate& delegate)
+Listener::Listener(ListenerOptions options, ListenerDelegate& delegate)
     : _delegate(delegate),
       _entitlements(options.entitlements),
       _lentFiles(options.lentFiles),
@@ -74,8 +71,7 @@ Listener::~Listener() {
 }
 
 bool Listener::resume() {
-  if (!_wakeUp.isOpen() ||
-      !_acceptThread.start("accept", ipc::kConnectionStackBytes, [this] { acceptLoop(); })) {
+  if (!_wakeUp.isOpen() || !_acceptThread.start("accept", kConnectionStackBytes, [this] { acceptLoop(); })) {
     logError("listener: No thread or descriptor for accepting connections");
     return false;
   }
@@ -90,7 +86,7 @@ std::size_t Listener::invalidate(std::chrono::steady_clock::time_point deadline)
   wake();
   _acceptThread.join();
   _socket.close();
-  std::vector<std::shared_ptr<ipc::SocketConnection>> connections;
+  std::vector<std::shared_ptr<SocketConnection>> connections;
   {
     Lock lock(_mutex);
     for (const auto& [number, client] : _clients) connections.push_back(client.connection);
@@ -150,10 +146,9 @@ void Listener::acceptSome() {
 bool Listener::acceptOne(std::vector<Arrived>& arrived) {
   FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
   if (socket.isOpen()) {
-    auto peer = platform::credentialsOfSocket(socket.get());
+    auto peer = credentialsOfSocket(socket.get());
     std::string refusal = peer ? refusalOf(peer.value()) : std::string();
-    arrived.push_back(
-        {std::move(socket), peer ? std::move(peer.value()) : platform::Peer{}, std::move(refusal)});
+    arrived.push_back({std::move(socket), peer ? std::move(peer.value()) : Peer{}, std::move(refusal)});
     return true;
   }
   switch (errno) {
@@ -172,13 +167,13 @@ bool Listener::acceptOne(std::vector<Arrived>& arrived) {
 }
 
 // What can be said without looking up anything but the credentials.
-std::string Listener::refusalOf(const platform::Peer& peer) {
+std::string Listener::refusalOf(const Peer& peer) {
   if (auto bound = boundReached(peer.uid)) return std::move(*bound);
-  if (_entitlements.mayHold(kVeltraEntitlement, peer.uid)) return {};
+  if (_entitlements.mayHold(wire::kVeltraEntitlement, peer.uid)) return {};
   _counters.count("connection refused: the peer does not hold the entitlement");
   logDebug(
       "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
-      ipc::SocketConnection::describe(_nextNumber++, peer).c_str());
+      SocketConnection::describe(_nextNumber++, peer).c_str());
   return refusedPeer(peer, "not looked up", _entitlementsPath);
 }
 
@@ -211,7 +206,7 @@ void Listener::warnOfAccept(int error) {
 }
 
 void Listener::admit(FileDescriptor socket) {
-  auto peer = platform::peerOfSocket(socket.get());
+  auto peer = peerOfSocket(socket.get());
   if (!peer) {
     _counters.count("connection refused: the kernel does not say who it is");
     return refuseSocket(std::move(socket),
@@ -221,8 +216,8 @@ void Listener::admit(FileDescriptor socket) {
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
   auto connection =
-      std::make_shared<ipc::SocketConnection>(number, std::move(socket), std::move(peer.value()),
-                                              _entitlements, _lentFiles, _counters, _memory.accountOf(uid));
+      std::make_shared<SocketConnection>(number, std::move(socket), std::move(peer.value()), _entitlements,
+                                         _lentFiles, _counters, _memory.accountOf(uid));
   if (connection->usable() && startClient(number, uid, connection)) return;
   _counters.count("connection refused: no thread or descriptor is left");
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");
@@ -249,31 +244,31 @@ std::optional<std::string> Listener::boundReached(unsigned uid) {
 }
 
 bool Listener::startClient(std::uint64_t number, unsigned uid,
-                           const std::shared_ptr<ipc::SocketConnection>& connection) {
+                           const std::shared_ptr<SocketConnection>& connection) {
   // The thread's last act takes the lock, so it finds its entry whole.
   Lock lock(_mutex);
   Client& client = _clients[number];
   client.connection = connection;
   client.uid = uid;
   ++_clientsOfUser[uid];
-  const bool started =
-      client.thread.start("connection", ipc::kConnectionStackBytes,
-                          [this, number, connection] { runConnection(number, *connection); });
+  const bool started = client.thread.start("connection", kConnectionStackBytes, [this, number, connection] {
+    runConnection(number, *connection);
+  });
   if (!started) forget(number);
   return started;
 }
 
 void Listener::reap() {
-  std::vector<ipc::Thread> finished;
+  std::vector<Thread> finished;
   {
     Lock lock(_mutex);
     finished.swap(_finished);
   }
-  for (ipc::Thread& thread : finished) thread.join();
+  for (Thread& thread : finished) thread.join();
 }
 
 // The connection's own thread, from here on.
-void Listener::runConnection(std::uint64_t number, ipc::SocketConnection& connection) {
+void Listener::runConnection(std::uint64_t number, SocketConnection& connection) {
   if (_delegate.listener(*this, connection.shared_from_this())) {
     connection.run();
   } else {
@@ -295,4 +290,4 @@ void Listener::forget(std::uint64_t number) {
   _clients.erase(client);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::ipc

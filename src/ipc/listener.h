@@ -8,25 +8,23 @@
 #include <string>
 #include <vector>
 
+#include "base/file_descriptor.h"
 #include "base/mutex.h"
+#include "base/thread.h"
+#include "ipc/connection.h"
+#include "ipc/entitlements.h"
 #include "ipc/service_socket.h"
-#include "ipc/thread.h"
 #include "platform/counters.h"
-#include "platform/entitlements.h"
-#include "platform/file_descriptor.h"
 #include "platform/lent_files.h"
 #include "platform/memory_budget.h"
-#include "protocol/connection.h"
 
-namespace veltrad {
-
-namespace ipc {
+namespace veltrad::ipc {
 
 class SocketConnection;
 
 struct ListenerOptions {
   ServiceSocket socket;
-  platform::Entitlements& entitlements;
+  Entitlements& entitlements;
   platform::LentFiles& lentFiles;
   platform::Counters& counters;
   platform::MemoryBudget& memory;
@@ -35,15 +33,13 @@ struct ListenerOptions {
   std::size_t mostConnectionsOfOneUser = 1024;
 };
 
-}  // namespace ipc
-
 // Job: every client that connects gets a Connection, on which the delegate decides on that connection's own
 // thread; a refused one gets a refusal frame that says why. The delegate, the entitlements, the lent files
 // and the counters outlive it. resume() and invalidate() belong to the thread that made it, which is never a
 // connection's own.
 class Listener {
  public:
-  Listener(ipc::ListenerOptions options, ListenerDelegate& delegate);
+  Listener(ListenerOptions options, ListenerDelegate& delegate);
   // Invalidates first if nobody did, and waits for every thread without a bound.
   ~Listener();
   Listener(const Listener&) = delete;
@@ -61,62 +57,57 @@ class Listener {
 
  private:
   struct Client {
-    std::shared_ptr<ipc::SocketConnection> connection;
-    ipc::Thread thread;
+    std::shared_ptr<SocketConnection> connection;
+    Thread thread;
     unsigned uid = 0;
   };
 
   void acceptLoop();
   struct Arrived {
-    platform::FileDescriptor socket;
-    platform::Peer peer;  // credentials alone
+    FileDescriptor socket;
+    Peer peer;            // credentials alone
     std::string refusal;  // empty: none that its user id tells
   };
   void acceptSome();
   bool acceptOne(std::vector<Arrived>& arrived);
   void acceptWithSpare(int error);
-  std::string refusalOf(const platform::Peer& peer);
+  std::string refusalOf(const Peer& peer);
   void pause(int error);
   void warnOfAccept(int error);
-  void admit(platform::FileDescriptor socket);
+  void admit(FileDescriptor socket);
   std::optional<std::string> boundReached(unsigned uid);
-  bool startClient(std::uint64_t number, unsigned uid,
-                   const std::shared_ptr<ipc::SocketConnection>& connection);
+  bool startClient(std::uint64_t number, unsigned uid, const std::shared_ptr<SocketConnection>& connection);
   void reap();
   void wake();
-  void runConnection(std::uint64_t number, ipc::SocketConnection& connection);
+  void runConnection(std::uint64_t number, SocketConnection& connection);
   void forget(std::uint64_t number) REQUIRES(_mutex);
 
   // Constant after construction.
   ListenerDelegate& _delegate;
-  platform::Entitlements& _entitlements;
+  Entitlements& _entitlements;
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
   platform::MemoryBudget& _memory;
   const std::string _entitlementsPath;
   const std::size_t _mostConnections;
   const std::size_t _mostConnectionsOfOneUser;
-  const platform::FileDescriptor _wakeUp;
+  const FileDescriptor _wakeUp;
 
   // The accepting thread's while it runs, else the owner's.
-  ipc::ServiceSocket _socket;
-  platform::FileDescriptor _spare;
+  ServiceSocket _socket;
+  FileDescriptor _spare;
   std::chrono::steady_clock::time_point _lastWarning{};
   std::uint64_t _nextNumber = 1;
 
   // The owner's.
-  ipc::Thread _acceptThread;
+  Thread _acceptThread;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   bool _stopping GUARDED_BY(_mutex) = false;
   std::map<std::uint64_t, Client> _clients GUARDED_BY(_mutex);
   std::map<unsigned, std::size_t> _clientsOfUser GUARDED_BY(_mutex);
-  std::vector<ipc::Thread> _finished GUARDED_BY(_mutex);
+  std::vector<Thread> _finished GUARDED_BY(_mutex);
 };
 
-namespace ipc {
-using veltrad::Listener;
-}
-
-}  // namespace veltrad
+}  // namespace veltrad::ipc

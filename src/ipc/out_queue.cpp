@@ -8,11 +8,11 @@
 #include <cerrno>
 #include <cstdint>
 
-#include "ipc/frame.h"
+#include "wire/frame.h"
 
 namespace veltrad::ipc {
 
-static_assert(kOutQueueBound == kFrameBodyLimit + kFrameHeaderBytes);
+static_assert(kOutQueueBound == wire::kFrameBodyLimit + wire::kFrameHeaderBytes);
 
 namespace {
 
@@ -23,7 +23,7 @@ constexpr std::size_t kBytesOfByte = 2;
 
 }  // namespace
 
-OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters,
+OutQueue::OutQueue(FileDescriptor socket, platform::Counters& counters,
                    std::shared_ptr<platform::MemoryAccount> account)
     : _counters(counters),
       _account(std::move(account)),
@@ -31,7 +31,7 @@ OutQueue::OutQueue(platform::FileDescriptor socket, platform::Counters& counters
       _readWakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
   Lock lock(_mutex);
   _socket = std::move(socket);
-  _wakeUp = platform::FileDescriptor(_readWakeUp);
+  _wakeUp = FileDescriptor(_readWakeUp);
   _gone = !_socket.isOpen();
 }
 
@@ -60,7 +60,7 @@ OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
 
 OutQueue::Sent OutQueue::put(std::string_view frame, Kind kind) {
   const std::size_t bound = kOutQueueBound + (kind == Kind::reply ? kReplyReserve : 0);
-  if (frame.size() > kFrameBodyLimit + kFrameHeaderBytes) return Sent::tooLarge;
+  if (frame.size() > wire::kFrameBodyLimit + wire::kFrameHeaderBytes) return Sent::tooLarge;
   const std::size_t whole = frame.size();
   Lock lock(_mutex);
   if (_gone) return Sent::gone;
@@ -167,7 +167,7 @@ std::size_t OutQueue::flush() {
 }
 
 void OutQueue::close() {
-  platform::FileDescriptor socket;
+  FileDescriptor socket;
   {
     Lock lock(_mutex);
     giveUp();
@@ -177,7 +177,7 @@ void OutQueue::close() {
   if (socket.isOpen()) closeGently(std::move(socket));
 }
 
-void closeGently(platform::FileDescriptor socket) {
+void closeGently(FileDescriptor socket) {
   // Once shut down the peer can write no more; an empty receive queue then makes the close an orderly one.
   ::shutdown(socket.get(), SHUT_RDWR);
   char bytes[4096];

@@ -7,9 +7,9 @@
 #include <string>
 #include <string_view>
 
+#include "base/file_descriptor.h"
 #include "base/mutex.h"
 #include "platform/counters.h"
-#include "platform/file_descriptor.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::ipc {
@@ -36,7 +36,7 @@ class OutQueue {
   };
 
   // Without a socket the client is gone from the start. What waits is charged to `account`; null: to nobody.
-  OutQueue(platform::FileDescriptor socket, platform::Counters& counters,
+  OutQueue(FileDescriptor socket, platform::Counters& counters,
            std::shared_ptr<platform::MemoryAccount> account);
   OutQueue(const OutQueue&) = delete;
   OutQueue& operator=(const OutQueue&) = delete;
@@ -87,8 +87,8 @@ class OutQueue {
   std::atomic<std::size_t> _waitingBytes{0};
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  platform::FileDescriptor _socket GUARDED_BY(_mutex);
-  platform::FileDescriptor _wakeUp GUARDED_BY(_mutex);
+  FileDescriptor _socket GUARDED_BY(_mutex);
+  FileDescriptor _wakeUp GUARDED_BY(_mutex);
   bool _gone GUARDED_BY(_mutex) = false;
   std::string _waiting GUARDED_BY(_mutex);
   platform::Charge _events GUARDED_BY(_mutex);   // kept: nobody need ever read them
@@ -97,6 +97,6 @@ class OutQueue {
 };
 
 // Shuts a socket down and closes it so that the peer can still read what was written to it.
-void closeGently(platform::FileDescriptor socket);
+void closeGently(FileDescriptor socket);
 
 }  // namespace veltrad::ipc

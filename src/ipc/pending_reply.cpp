@@ -5,14 +5,14 @@
 
 #include <new>
 
-#include "ipc/frame.h"
+#include "wire/frame.h"
 
 namespace veltrad::ipc {
 
 PendingReply::~PendingReply() {
   if (_answered.load(std::memory_order_acquire)) return;
   try {
-    fail(makeReportingError("The daemon gave no reply.", -1));
+    fail(wire::makeReportingError("The daemon gave no reply.", -1));
   } catch (const std::bad_alloc&) {
     _out->requestEnd();
   }
@@ -25,9 +25,9 @@ void PendingReply::answer(Dictionary results) {
   send(std::move(body));
 }
 
-void PendingReply::fail(const ReportingError& error) {
+void PendingReply::fail(const wire::ReportingError& error) {
   if (_answered.exchange(true, std::memory_order_acq_rel)) return;
-  send({{"error", dictionaryOfError(error)}});
+  send({{"error", wire::dictionaryOfError(error)}});
 }
 
 void PendingReply::send(Dictionary body) noexcept {
@@ -39,24 +39,25 @@ void PendingReply::send(Dictionary body) noexcept {
 }
 
 void PendingReply::sendFrame(Dictionary body) {
-  const std::string frame = makeFrame(FrameKind::reply, _callID, std::move(body));
+  const std::string frame = wire::makeFrame(wire::FrameKind::reply, _callID, std::move(body));
   if (_out->sendReply(frame) != OutQueue::Sent::tooLarge) return;
-  const ReportingError error =
-      makeReportingError(fmt::format("The reply of {} bytes is larger than a frame may be ({} bytes).",
-                                     frame.size() - kFrameHeaderBytes, kFrameBodyLimit),
-                         -1);
-  _out->sendReply(makeFrame(FrameKind::reply, _callID, {{"error", dictionaryOfError(error)}}));
+  const wire::ReportingError error =
+      wire::makeReportingError(fmt::format("The reply of {} bytes is larger than a frame may be ({} bytes).",
+                                           frame.size() - wire::kFrameHeaderBytes, wire::kFrameBodyLimit),
+                               -1);
+  _out->sendReply(
+      wire::makeFrame(wire::FrameKind::reply, _callID, {{"error", wire::dictionaryOfError(error)}}));
 }
 
 namespace {
 
-void setError(Dictionary& results, const std::optional<ReportingError>& error) {
-  if (error) results.set("error", dictionaryOfError(*error));
+void setError(Dictionary& results, const std::optional<wire::ReportingError>& error) {
+  if (error) results.set("error", wire::dictionaryOfError(*error));
 }
 
 }  // namespace
 
-StringReply stringReply(std::shared_ptr<PendingReply> pending) {
+wire::StringReply stringReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::string> text) {
     Dictionary results;
@@ -65,7 +66,7 @@ StringReply stringReply(std::shared_ptr<PendingReply> pending) {
   };
 }
 
-NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
+wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::vector<std::string>> names) {
     Dictionary results;
@@ -74,25 +75,25 @@ NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
   };
 }
 
-FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
+wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
-  return
-      [pending = std::move(pending)](std::optional<std::string> text, std::optional<ReportingError> error) {
-        Dictionary results;
-        if (text) results.set("reply", std::move(*text));
-        setError(results, error);
-        pending->answer(std::move(results));
-      };
+  return [pending = std::move(pending)](std::optional<std::string> text,
+                                        std::optional<wire::ReportingError> error) {
+    Dictionary results;
+    if (text) results.set("reply", std::move(*text));
+    setError(results, error);
+    pending->answer(std::move(results));
+  };
 }
 
-BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending) {
+wire::BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](bool uploaded) { pending->answer({{"uploaded", uploaded}}); };
 }
 
-UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending) {
+wire::UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
-  return [pending = std::move(pending)](bool uploaded, std::optional<ReportingError> error) {
+  return [pending = std::move(pending)](bool uploaded, std::optional<wire::ReportingError> error) {
     Dictionary results{{"uploaded", uploaded}};
     setError(results, error);
     pending->answer(std::move(results));

@@ -7,7 +7,7 @@
 
 #include "base/value.h"
 #include "ipc/out_queue.h"
-#include "protocol/client_session_interface.h"
+#include "wire/client_session_interface.h"
 
 namespace veltrad::ipc {
 
@@ -22,7 +22,7 @@ class PendingReply {
 
   // Only the first of all calls to either counts.
   void answer(Dictionary results);
-  void fail(const ReportingError& error);
+  void fail(const wire::ReportingError& error);
 
  private:
   void send(Dictionary body) noexcept;
@@ -34,10 +34,10 @@ class PendingReply {
 };
 
 // The callbacks that a session gets. Each is empty when `pending` is null: the client wants no reply.
-StringReply stringReply(std::shared_ptr<PendingReply> pending);
-NamesReply namesReply(std::shared_ptr<PendingReply> pending);
-FlushReply flushReply(std::shared_ptr<PendingReply> pending);
-BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending);
-UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending);
+wire::StringReply stringReply(std::shared_ptr<PendingReply> pending);
+wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending);
+wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending);
+wire::BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending);
+wire::UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending);
 
 }  // namespace veltrad::ipc

@@ -3,7 +3,7 @@
 
 #include <fmt/format.h>
 
-#include "ipc/frame.h"
+#include "wire/frame.h"
 
 namespace veltrad::ipc {
 
@@ -15,7 +15,7 @@ void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, do
   if (payload) arguments.set("payload", std::move(*payload));
   Dictionary body{{"op", "sendMessageToClient:timestamp:category:type:payload:"}};
   body.set("args", std::move(arguments));
-  const std::string frame = makeFrame(FrameKind::event, 0, std::move(body));
+  const std::string frame = wire::makeFrame(wire::FrameKind::event, 0, std::move(body));
   const OutQueue::Sent sent = _out->sendEvent(frame);
   if (sent == OutQueue::Sent::done || !_handler) return;
   switch (sent) {
@@ -25,7 +25,7 @@ void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, do
       return;
     case OutQueue::Sent::tooLarge:
       _handler(fmt::format("The event of {} bytes is larger than a frame may be ({} bytes).",
-                           frame.size() - kFrameHeaderBytes, kFrameBodyLimit));
+                           frame.size() - wire::kFrameHeaderBytes, wire::kFrameBodyLimit));
       return;
     case OutQueue::Sent::gone:
       _handler("The client has gone.");
@@ -39,7 +39,7 @@ bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
   Dictionary body{{"op", "removeUploadedFile:"}};
   body.set("args", Dictionary{{"call", callID}});
   // Within the bound of replies: it is worth as much as the one that follows it.
-  return out.sendReply(makeFrame(FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
+  return out.sendReply(wire::makeFrame(wire::FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }
 
 }  // namespace veltrad::ipc

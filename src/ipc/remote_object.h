@@ -6,13 +6,13 @@
 #include <string>
 
 #include "ipc/out_queue.h"
-#include "protocol/client_session_reply_interface.h"
+#include "wire/client_session_reply_interface.h"
 
 namespace veltrad::ipc {
 
 // Job: turns calls on the client's object into event frames. Never blocks; holds the out-queue alone, so it
 // may outlive the connection. The handler runs on the calling thread, inside the call that failed.
-class RemoteObject final : public ClientSessionReplyInterface {
+class RemoteObject final : public wire::ClientSessionReplyInterface {
  public:
   using ErrorHandler = std::function<void(const std::string& description)>;
   RemoteObject(std::shared_ptr<OutQueue> out, ErrorHandler handler)

@@ -15,8 +15,6 @@ namespace veltrad::ipc {
 
 namespace {
 
-using platform::FileDescriptor;
-
 constexpr int kWaitingConnections = 1024;
 
 std::string reason(int error) {

@@ -7,8 +7,8 @@
 #include <optional>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "base/result.h"
-#include "platform/file_descriptor.h"
 #include "platform/root.h"
 
 namespace veltrad::ipc {
@@ -23,7 +23,7 @@ class ServiceSocket {
     ino_t file = 0;
   };
   // Without `made`: a socket that was handed over.
-  ServiceSocket(platform::FileDescriptor listening, platform::FileDescriptor lock, std::optional<Made> made)
+  ServiceSocket(FileDescriptor listening, FileDescriptor lock, std::optional<Made> made)
       : _listening(std::move(listening)), _lock(std::move(lock)), _made(std::move(made)) {}
   ServiceSocket(ServiceSocket&&) = default;
   ServiceSocket& operator=(ServiceSocket&&) = delete;
@@ -35,8 +35,8 @@ class ServiceSocket {
   void close();
 
  private:
-  platform::FileDescriptor _listening;
-  platform::FileDescriptor _lock;
+  FileDescriptor _listening;
+  FileDescriptor _lock;
   std::optional<Made> _made;
 };
 

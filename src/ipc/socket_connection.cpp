@@ -27,16 +27,16 @@ constexpr const char* kDaemonVersion = "8.0";
 }  // namespace
 
 std::string refusalFrame(const std::string& description) {
-  return makeFrame(FrameKind::refusal, 0,
-                   {{"error", dictionaryOfError(makeReportingError(description, -1))}});
+  return wire::makeFrame(wire::FrameKind::refusal, 0,
+                         {{"error", wire::dictionaryOfError(wire::makeReportingError(description, -1))}});
 }
 
-std::string SocketConnection::describe(std::uint64_t number, const platform::Peer& peer) {
+std::string SocketConnection::describe(std::uint64_t number, const Peer& peer) {
   return fmt::format("connection {} (uid {}, pid {})", number, peer.uid, peer.pid);
 }
 
-SocketConnection::SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                                   platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
+SocketConnection::SocketConnection(std::uint64_t number, FileDescriptor socket, Peer peer,
+                                   Entitlements& entitlements, platform::LentFiles& lentFiles,
                                    platform::Counters& counters,
                                    std::shared_ptr<platform::MemoryAccount> account)
     : _out(std::make_shared<OutQueue>(std::move(socket), counters, account)),
@@ -52,7 +52,7 @@ std::optional<Value> SocketConnection::valueForEntitlement(std::string_view name
   return _entitlements.valueForEntitlement(name, _peer);
 }
 
-std::shared_ptr<ClientSessionReplyInterface> SocketConnection::remoteObjectProxyWithErrorHandler(
+std::shared_ptr<wire::ClientSessionReplyInterface> SocketConnection::remoteObjectProxyWithErrorHandler(
     std::function<void(const std::string&)> handler) {
   return std::make_shared<RemoteObject>(_out, std::move(handler));
 }
@@ -90,21 +90,21 @@ void SocketConnection::serve() {
 
 // Every whole frame that is there, unless the client must first read what waits for it. False: the end.
 bool SocketConnection::runFrames() {
-  Frame frame;
+  wire::Frame frame;
   while (!_out->endRequested() && !overdue()) {
     if (_out->waitingBytes() > kOutQueueHighWater && !_stopping.load(std::memory_order_acquire)) {
       waitForClientToRead();
       continue;
     }
     switch (_reader.next(frame)) {
-      case FrameReader::Next::frame:
+      case wire::FrameReader::Next::frame:
         if (!runFrame(frame)) return false;
         break;
-      case FrameReader::Next::impossible:
+      case wire::FrameReader::Next::impossible:
         return violation(
             fmt::format("A frame of {} bytes with {} descriptors is impossible: at most {} and 1.",
                         frame.header.bodyLength, frame.header.descriptors, frame.header.bodyLimit()));
-      case FrameReader::Next::needMore:
+      case wire::FrameReader::Next::needMore:
         if (_reader.strayDescriptors()) return violation("A descriptor came that no frame announced.");
         return true;
     }
@@ -169,8 +169,8 @@ void SocketConnection::poll(short events, int milliseconds) {
   if (::poll(watched, 2, milliseconds) > 0 && watched[1].revents != 0) _out->drainWakeUp();
 }
 
-bool SocketConnection::runFrame(const Frame& frame) {
-  platform::FileDescriptor lent;
+bool SocketConnection::runFrame(const wire::Frame& frame) {
+  FileDescriptor lent;
   if (frame.header.descriptors == 1) {
     auto came = _reader.takeDescriptor();
     if (!came) return violation("A frame announced a descriptor, and none came.");
@@ -187,7 +187,7 @@ bool SocketConnection::runFrame(const Frame& frame) {
 }
 
 // What came with the frame is lent for the call, whose reply follows a request to remove the file.
-std::optional<std::string> SocketConnection::runCall(const Frame& frame, platform::FileDescriptor lent) {
+std::optional<std::string> SocketConnection::runCall(const wire::Frame& frame, FileDescriptor lent) {
   if (!lent.isOpen()) return dispatch(frame);
   const auto loan = _lentFiles.lend(std::move(lent), _peer.pid, [out = _out, callID = frame.header.callID] {
     return callID != 0 && sendRemoveUploadedFile(*out, callID);
@@ -195,8 +195,9 @@ std::optional<std::string> SocketConnection::runCall(const Frame& frame, platfor
   return dispatch(frame, loan.token());
 }
 
-std::optional<std::string> SocketConnection::dispatch(const Frame& frame, const std::string& extensionToken) {
-  const bool large = frame.header.kind == FrameKind::largeCall;
+std::optional<std::string> SocketConnection::dispatch(const wire::Frame& frame,
+                                                      const std::string& extensionToken) {
+  const bool large = frame.header.kind == wire::FrameKind::largeCall;
   CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters,
                     [this] { return overdue(); }};
   auto refusal = dispatchCall(frame, *_session, _out, memory, extensionToken);
@@ -204,8 +205,8 @@ std::optional<std::string> SocketConnection::dispatch(const Frame& frame, const 
   return refusal;
 }
 
-bool SocketConnection::greet(const Frame& frame) {
-  if (frame.header.kind != FrameKind::hello) {
+bool SocketConnection::greet(const wire::Frame& frame) {
+  if (frame.header.kind != wire::FrameKind::hello) {
     return violation(fmt::format("The first frame must be a hello (kind 1), not of kind {}.",
                                  static_cast<unsigned>(frame.header.kind)));
   }
@@ -214,12 +215,13 @@ bool SocketConnection::greet(const Frame& frame) {
   const Value* stated = body.value().find("wire");
   const auto wire = stated ? stated->toInt64() : std::nullopt;
   if (!wire) return violation("The hello cannot be read: \"wire\" must be a number.");
-  if (*wire != kWireVersion) {
-    return violation(
-        fmt::format("The client speaks wire version {}, the daemon speaks version {}.", *wire, kWireVersion));
+  if (*wire != wire::kWireVersion) {
+    return violation(fmt::format("The client speaks wire version {}, the daemon speaks version {}.", *wire,
+                                 wire::kWireVersion));
   }
   _greeted = true;
-  _out->sendReply(makeFrame(FrameKind::hello, 0, {{"wire", kWireVersion}, {"daemon", kDaemonVersion}}));
+  _out->sendReply(
+      wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", wire::kWireVersion}, {"daemon", kDaemonVersion}}));
   return true;
 }
 

@@ -7,13 +7,13 @@
 #include <memory>
 #include <string>
 
+#include "ipc/connection.h"
+#include "ipc/entitlements.h"
 #include "ipc/out_queue.h"
+#include "ipc/peer.h"
 #include "ipc/socket_reader.h"
 #include "platform/counters.h"
-#include "platform/entitlements.h"
 #include "platform/lent_files.h"
-#include "platform/peer.h"
-#include "protocol/connection.h"
 
 namespace veltrad::ipc {
 
@@ -23,13 +23,13 @@ namespace veltrad::ipc {
 // counters outlive it. A session and its connection hold each other until run() returns.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
-  SocketConnection(std::uint64_t number, platform::FileDescriptor socket, platform::Peer peer,
-                   platform::Entitlements& entitlements, platform::LentFiles& lentFiles,
-                   platform::Counters& counters, std::shared_ptr<platform::MemoryAccount> account);
+  SocketConnection(std::uint64_t number, FileDescriptor socket, Peer peer, Entitlements& entitlements,
+                   platform::LentFiles& lentFiles, platform::Counters& counters,
+                   std::shared_ptr<platform::MemoryAccount> account);
 
   // False: the system had no wake-up descriptor for it.
   bool usable() const { return _out->usable(); }
-  const platform::Peer& peer() const { return _peer; }
+  const Peer& peer() const { return _peer; }
 
   // The whole life after the delegate said yes: frames until the end, then the invalidation handler, the
   // session's end(), and the socket closed.
@@ -40,11 +40,11 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   void stop(std::chrono::steady_clock::time_point deadline);
 
   // "connection 12 (uid 0, pid 345)"
-  static std::string describe(std::uint64_t number, const platform::Peer& peer);
+  static std::string describe(std::uint64_t number, const Peer& peer);
   std::string description() const override { return _description; }
   std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return _account; }
   std::optional<Value> valueForEntitlement(std::string_view name) override;
-  void setExportedObject(std::shared_ptr<ClientSessionInterface> session) override {
+  void setExportedObject(std::shared_ptr<wire::ClientSessionInterface> session) override {
     _session = std::move(session);
   }
   void setInterruptionHandler(std::function<void()> handler) override {
@@ -54,16 +54,16 @@ class SocketConnection final : public Connection, public std::enable_shared_from
     _invalidationHandler = std::move(handler);
   }
   void resume() override { _resumed = true; }
-  std::shared_ptr<ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
+  std::shared_ptr<wire::ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
       std::function<void(const std::string&)> handler) override;
 
  private:
   void serve();
   bool runFrames();
-  bool runFrame(const Frame& frame);
-  std::optional<std::string> runCall(const Frame& frame, platform::FileDescriptor lent);
-  std::optional<std::string> dispatch(const Frame& frame, const std::string& extensionToken = {});
-  bool greet(const Frame& frame);
+  bool runFrame(const wire::Frame& frame);
+  std::optional<std::string> runCall(const wire::Frame& frame, FileDescriptor lent);
+  std::optional<std::string> dispatch(const wire::Frame& frame, const std::string& extensionToken = {});
+  bool greet(const wire::Frame& frame);
   bool receive();
   bool waitForRoom();
   void waitForClientToRead();
@@ -78,16 +78,16 @@ class SocketConnection final : public Connection, public std::enable_shared_from
 
   // Constant after construction.
   const std::shared_ptr<OutQueue> _out;
-  const platform::Peer _peer;
+  const Peer _peer;
   const std::string _description;
   const std::shared_ptr<platform::MemoryAccount> _account;
-  platform::Entitlements& _entitlements;
+  Entitlements& _entitlements;
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
 
   // Own thread only.
   SocketReader _reader;
-  std::shared_ptr<ClientSessionInterface> _session;
+  std::shared_ptr<wire::ClientSessionInterface> _session;
   std::function<void()> _interruptionHandler;
   std::function<void()> _invalidationHandler;
   bool _resumed = false;

@@ -8,13 +8,13 @@
 #include <cstring>
 #include <tuple>
 
-#include "platform/file_origin.h"
+#include "wire/file_origin.h"
 
 namespace veltrad::ipc {
 
 namespace {
 
-constexpr std::size_t kLeastRoom = kIdleReadBytes;
+constexpr std::size_t kLeastRoom = wire::kIdleReadBytes;
 // Of the bytes of a large call's body: the frame, its values, and what is made of them.
 constexpr std::size_t kLargeCallFactor = 3;
 constexpr std::size_t kMostRoom = 64u << 10;
@@ -23,17 +23,17 @@ constexpr std::size_t kDescriptorsAtOnce = 4;
 constexpr std::size_t kMostDescriptors = 16;
 
 // False: more came than there was room for.
-bool takeControl(msghdr& message, std::deque<platform::FileDescriptor>& into) {
+bool takeControl(msghdr& message, std::deque<FileDescriptor>& into) {
   for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
     if (part->cmsg_level != SOL_SOCKET || part->cmsg_type != SCM_RIGHTS) continue;
     const std::size_t count = (part->cmsg_len - CMSG_LEN(0)) / sizeof(int);
     for (std::size_t i = 0; i < count; ++i) {
       int number = -1;
       std::memcpy(&number, CMSG_DATA(part) + i * sizeof number, sizeof number);
-      platform::FileDescriptor came(number);
+      FileDescriptor came(number);
       // Closed at once, or a client that lends its own end would keep its connection. Its place stays taken:
       // the frame that announced it runs without a file.
-      if (platform::isNoRegularFile(number)) came.reset();
+      if (wire::isNoRegularFile(number)) came.reset();
       into.push_back(std::move(came));
     }
   }
@@ -74,7 +74,7 @@ SocketReader::Got SocketReader::receive(int socket) {
 
 bool SocketReader::bufferOf(std::size_t bytes) {
   if (!_account || _large.bytes() > 0) return true;
-  const std::size_t wanted = bytes > kIdleReadBytes ? bytes - kIdleReadBytes : 0;
+  const std::size_t wanted = bytes > wire::kIdleReadBytes ? bytes - wire::kIdleReadBytes : 0;
   if (wanted > _charge.bytes()) return chargeMore(wanted - _charge.bytes());
   return _charge.resize(wanted);
 }
@@ -95,16 +95,16 @@ bool SocketReader::hopeless() const {
   return _account && _account->unfinishedFull(_lacking);
 }
 
-bool SocketReader::admitLargeCall(const FrameHeader& header) {
+bool SocketReader::admitLargeCall(const wire::FrameHeader& header) {
   if (!_account) return true;
   auto charge = _account->tryCharge(kLargeCallFactor * header.bodyLength, platform::MemoryUse::working);
   if (charge) _large = std::move(*charge);
   return charge.has_value();
 }
 
-std::optional<platform::FileDescriptor> SocketReader::takeDescriptor() {
+std::optional<FileDescriptor> SocketReader::takeDescriptor() {
   if (_descriptors.empty()) return std::nullopt;
-  platform::FileDescriptor first = std::move(_descriptors.front());
+  FileDescriptor first = std::move(_descriptors.front());
   _descriptors.pop_front();
   return first;
 }

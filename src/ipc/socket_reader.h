@@ -5,16 +5,16 @@
 #include <memory>
 #include <optional>
 
-#include "ipc/frame.h"
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "platform/memory_budget.h"
+#include "wire/frame.h"
 
 namespace veltrad::ipc {
 
 // Job: reads without blocking into a FrameReader and queues the descriptors that came along, in order of
 // arrival. Of descriptors that nobody asks for it keeps a few, no more. The buffer is charged to the client's
 // user before it grows, as the bytes of an unfinished frame; log data as a whole call, when its header comes.
-class SocketReader : private FrameMemory {
+class SocketReader : private wire::FrameMemory {
  public:
   enum class Got {
     bytes,
@@ -31,8 +31,8 @@ class SocketReader : private FrameMemory {
   SocketReader& operator=(const SocketReader&) = delete;
 
   Got receive(int socket);
-  FrameReader::Next next(Frame& frame) { return _frames.next(frame); }
-  std::optional<platform::FileDescriptor> takeDescriptor();
+  wire::FrameReader::Next next(wire::Frame& frame) { return _frames.next(frame); }
+  std::optional<FileDescriptor> takeDescriptor();
   // Descriptors that belong to no frame: all frames that came were taken, nothing else has begun.
   bool strayDescriptors() const { return !_descriptors.empty() && _frames.empty(); }
   // The last receive() may have left bytes in the socket, so that another one is worth its price.
@@ -47,14 +47,14 @@ class SocketReader : private FrameMemory {
 
  private:
   bool bufferOf(std::size_t bytes) override;
-  bool admitLargeCall(const FrameHeader& header) override;
+  bool admitLargeCall(const wire::FrameHeader& header) override;
   bool chargeMore(std::size_t bytes);
 
   const std::shared_ptr<platform::MemoryAccount> _account;
   platform::Charge _charge;  // the buffer's
   platform::Charge _large;   // of a large call that is coming
-  FrameReader _frames;
-  std::deque<platform::FileDescriptor> _descriptors;
+  wire::FrameReader _frames;
+  std::deque<FileDescriptor> _descriptors;
   std::size_t _wanted = 0;
   std::size_t _lacking = 0;
   bool _moreLikely = true;

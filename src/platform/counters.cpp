@@ -3,7 +3,7 @@
 
 #include <unistd.h>
 
-#include "base/json.h"
+#include "formats/json.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 
@@ -50,7 +50,7 @@ void Counters::writeIfChanged(FileStore& files, const std::string& path, double 
     failedBefore = _failed;
   }
   const Dictionary all{{"pid", static_cast<int>(::getpid())}, {"started", startedAt}, {"counts", snapshot()}};
-  const auto failure = files.replace(path, writeJSON(all) + "\n", 0644);
+  const auto failure = files.replace(path, formats::writeJSON(all) + "\n", 0644);
   if (failure && !failedBefore)
     logError("The counters could not be written: %s", failure->description.c_str());
   Lock lock(_mutex);

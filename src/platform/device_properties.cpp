@@ -1,7 +1,7 @@
 // The configured property list first, then the machine. Any thread; files are read at each question.
 #include "platform/device_properties.h"
 
-#include "base/property_list.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 #include "platform/machine_facts.h"
@@ -51,7 +51,7 @@ Result<Dictionary, FileFailure> MachineProperties::readList() {
     if (bytes.error().kind != FileFailure::Kind::notFound) complainOnce(bytes.error().description);
     return Dictionary();
   }
-  const auto list = parsePropertyList(bytes.value());
+  const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
   if (dictionary) return *dictionary;
   complainOnce(_path + ": " +

@@ -11,7 +11,7 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "platform/shortage.h"
 #include "platform/uuid.h"
 

@@ -7,9 +7,9 @@
 #include <memory>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "base/mutex.h"
-#include "platform/file_descriptor.h"
-#include "platform/file_origin.h"
+#include "wire/file_origin.h"
 
 namespace veltrad::platform {
 
@@ -23,7 +23,7 @@ class LentFile {
 
   int descriptor() const { return _file.get(); }
   // To be asked before anything else is done with the descriptor.
-  FileOrigin origin() const { return FileOrigin::of(_file.get(), _lender); }
+  wire::FileOrigin origin() const { return wire::FileOrigin::of(_file.get(), _lender); }
   // Asks the lender to remove its file, without waiting; the lender may refuse. False: it cannot be asked.
   [[nodiscard]] bool askForRemoval() const { return _askForRemoval(); }
 

@@ -3,7 +3,7 @@
 
 #include <utility>
 
-#include "base/property_list.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 
@@ -124,7 +124,7 @@ Result<Dictionary, FileFailure> FilePreferences::read(std::string_view domain, C
         failure.kind == FileFailure::Kind::noAccess || failure.kind == FileFailure::Kind::tooLarge;
     return refused(path, failure, ofTheFile, complaints);
   }
-  const auto list = parsePropertyList(bytes.value());
+  const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* all = list ? list.value().asDictionary() : nullptr;
   if (all) return *all;
   const std::string why = list ? "the outermost value is not a dictionary" : list.error().detail;

@@ -1,7 +1,7 @@
 // Where the system's fixed paths begin. Any thread.
 #include "platform/root.h"
 
-#include <cstdlib>
+#include "wire/socket_path.h"
 
 namespace veltrad::platform {
 
@@ -11,15 +11,15 @@ Root::Root(std::string directory) : _directory(std::move(directory)) {
 }
 
 Root Root::fromEnvironment() {
-  const char* directory = std::getenv("VELTRA_ROOT");
-  return Root(directory && *directory ? directory : "/");
+  return Root(wire::rootFromEnvironment());
 }
 
 std::string Root::path(std::string_view relative) const {
-  std::string path = _directory;
-  if (path.back() != '/') path += '/';
-  path += relative;
-  return path;
+  return wire::pathUnder(_directory, relative);
+}
+
+std::string Root::socketPath() const {
+  return wire::socketPathUnder(_directory);
 }
 
 }  // namespace veltrad::platform

@@ -18,7 +18,7 @@ class Root {
   std::string path(std::string_view relative) const;
 
   std::string runDirectory() const { return path("run/veltrad"); }
-  std::string socketPath() const { return path("run/veltrad/com.florn.veltrad.sock"); }
+  std::string socketPath() const;
   std::string lockPath() const { return path("run/veltrad/lock"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string preferencesDirectory() const { return path("var/lib/veltrad/preferences"); }

@@ -12,7 +12,7 @@
 #include <string_view>
 #include <system_error>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 #include "platform/landlock.h"
 #include "platform/root.h"
 

@@ -5,6 +5,8 @@
 
 namespace veltrad::platform {
 
+class ServiceManager;
+
 class Transaction {
  public:
   virtual ~Transaction() = default;
@@ -12,8 +14,6 @@ class Transaction {
   virtual void open() = 0;
   virtual void close() = 0;
 };
-
-class ServiceManager;
 
 // Tells the service manager, as STATUS text, whether sessions are served.
 class ServiceTransaction final : public Transaction {

@@ -9,8 +9,8 @@ namespace veltrad::platform {
 
 std::array<unsigned char, 16> randomUUID() {
   std::array<unsigned char, 16> bytes{};
-  // So few bytes come whole, and once the kernel's generator is ready neither a signal nor a shortage stops them. OpenSSL's
-  // own generator would cost a start 8 million instructions, and can fail for want of memory.
+  // So few bytes come whole, and once the kernel's generator is ready neither a signal nor a shortage stops
+  // them. OpenSSL's own generator would cost a start 8 million instructions, and can fail for want of memory.
   if (getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) std::abort();
   bytes[6] = static_cast<unsigned char>((bytes[6] & 0x0f) | 0x40);
   bytes[8] = static_cast<unsigned char>((bytes[8] & 0x3f) | 0x80);

@@ -4,15 +4,15 @@
 #include "backends/backend_factory.h"
 #include "platform/clock.h"
 #include "platform/log.h"
-#include "protocol/constants.h"
-#include "protocol/veltra.h"
 #include "support/device_identity.h"
+#include "support/veltra.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
                                                  const Dictionary* sessionInfo,
-                                                 const SharedDictionary& userInfo,
+                                                 const backends::SharedDictionary& userInfo,
                                                  const std::string& deviceID) {
   if (!storebag) {
     logError("createBackends: Attempted to create backends with nil storebag");
@@ -30,22 +30,23 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, co
   const bool isInternal = making.device.isInternalBuild();
   const std::string selfVersion = making.library.packageVersion();
 
-  const std::int32_t clientType = sessionInfo->int32(kVeltraSessionInfoClientType).value_or(0);
+  const std::int32_t clientType = sessionInfo->int32(wire::kVeltraSessionInfoClientType).value_or(0);
   const auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : *storebag) {
     const auto backend = making.factory.newBackendWithName(name, profile, productFamily, clientType,
                                                            {making.account, making.oneShot});
     if (!backend) continue;
-    backend->setSessionID(sessionInfo->uint32(kVeltraSessionInfoSessionID).value_or(0));
+    backend->setSessionID(sessionInfo->uint32(wire::kVeltraSessionInfoSessionID).value_or(0));
     backend->setCompType(clientType);
-    backend->setClientVersion(sessionInfo->uint16(kVeltraSessionInfoClientVersion).value_or(0));
+    backend->setClientVersion(sessionInfo->uint16(wire::kVeltraSessionInfoClientVersion).value_or(0));
     backend->setUdid(deviceID);
     backend->setProductVersion(productVersion);
     backend->setBuildVersion(buildVersion);
     backend->setHardwareType(hardwareType);
     backend->setIsInternal(isInternal);
-    backend->setRequireUserInfo(sessionInfo->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false));
-    backend->setBatchEvents(sessionInfo->boolean(kVeltraSessionInfoBatchEvent).value_or(false));
+    backend->setRequireUserInfo(
+        sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false));
+    backend->setBatchEvents(sessionInfo->boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false));
     backend->setUserInfoDict(userInfo);
     backend->setSelfVersion(selfVersion);
     backend->setStartTimestamp(start);
@@ -59,9 +60,10 @@ std::vector<std::string> reportingNames(const BackendSet& backends) {
   std::vector<std::string> names;
   for (const auto& [name, backend] : backends) {
     const std::int32_t state = backend->state();
-    if (state == kBackendReporting || state == kBackendHeld) names.push_back(backend->name());
+    if (state == backends::kBackendReporting || state == backends::kBackendHeld)
+      names.push_back(backend->name());
   }
   return names;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -9,23 +9,29 @@
 #include "backends/backend.h"
 #include "base/value.h"
 
-namespace veltrad {
-
+namespace veltrad::backends {
 class BackendFactory;
-class DeviceIdentity;
-class Veltra;
-namespace platform {
+}  // namespace veltrad::backends
+
+namespace veltrad::platform {
 class Clock;
 class MemoryAccount;
-}  // namespace platform
+}  // namespace veltrad::platform
+
+namespace veltrad::support {
+class DeviceIdentity;
+class Veltra;
+}  // namespace veltrad::support
+
+namespace veltrad::session {
 
 // By name; the order of the names' bytes is the order in which backends are asked.
-using BackendSet = std::map<std::string, std::shared_ptr<VeltraBackend>, std::less<>>;
+using BackendSet = std::map<std::string, std::shared_ptr<backends::VeltraBackend>, std::less<>>;
 
 struct BackendMaking {
-  BackendFactory& factory;
-  DeviceIdentity& device;
-  const Veltra& library;
+  backends::BackendFactory& factory;
+  support::DeviceIdentity& device;
+  const support::Veltra& library;
   platform::Clock& clock;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
@@ -35,10 +41,10 @@ struct BackendMaking {
 // with one error line, without a storebag or without session info. `deviceID` may be empty.
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
                                                  const Dictionary* sessionInfo,
-                                                 const SharedDictionary& userInfo,
+                                                 const backends::SharedDictionary& userInfo,
                                                  const std::string& deviceID);
 
 // The names of those in state 2 or 3.
 std::vector<std::string> reportingNames(const BackendSet& backends);
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -1,9 +1,9 @@
 // The counting of flushes.
 #include "session/flush_counters.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
-std::shared_ptr<PendingFlush> FlushCounters::begin(std::size_t backends, FlushReply completion) {
+std::shared_ptr<PendingFlush> FlushCounters::begin(std::size_t backends, wire::FlushReply completion) {
   auto flush = std::make_shared<PendingFlush>();
   flush->pending = backends;
   flush->completion = std::move(completion);
@@ -11,8 +11,8 @@ std::shared_ptr<PendingFlush> FlushCounters::begin(std::size_t backends, FlushRe
 }
 
 void FlushCounters::finished(PendingFlush& flush, const std::optional<std::string>& answer,
-                             const std::optional<ReportingError>& error) {
-  FlushReply completion;
+                             const std::optional<wire::ReportingError>& error) {
+  wire::FlushReply completion;
   {
     const Lock held(_mutex);
     if (flush.pending > 0) --flush.pending;
@@ -21,4 +21,4 @@ void FlushCounters::finished(PendingFlush& flush, const std::optional<std::strin
   if (completion) completion(answer, error);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

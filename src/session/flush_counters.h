@@ -6,28 +6,28 @@
 #include <string>
 
 #include "base/mutex.h"
-#include "protocol/client_session_interface.h"
-#include "protocol/error.h"
+#include "wire/client_session_interface.h"
+#include "wire/error.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 // One flush: how many backends are still to answer, and the completion while it is held.
 struct PendingFlush {
   std::size_t pending = 0;
-  FlushReply completion;  // empty once called, or when nobody waits
+  wire::FlushReply completion;  // empty once called, or when nobody waits
 };
 
 // One lock for the flushes of all sessions; the daemon has one object.
 class FlushCounters {
  public:
-  std::shared_ptr<PendingFlush> begin(std::size_t backends, FlushReply completion);
+  std::shared_ptr<PendingFlush> begin(std::size_t backends, wire::FlushReply completion);
   // One backend has answered. The completion is called once: at the first error, or with the last answer;
   // outside the lock.
   void finished(PendingFlush& flush, const std::optional<std::string>& answer,
-                const std::optional<ReportingError>& error);
+                const std::optional<wire::ReportingError>& error);
 
  private:
   Mutex _mutex FLUSH_COUNTERS_LOCK{LockRank::flushCounters};
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::session

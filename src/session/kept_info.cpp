@@ -2,9 +2,9 @@
 #include "session/kept_info.h"
 
 #include "platform/memory_budget.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 namespace {
 struct Kept {
@@ -15,14 +15,15 @@ struct Kept {
 // The lists of identities have keys made of these, each kept three times.
 std::size_t keyBytes(const Dictionary& info) {
   std::size_t bytes = 0;
-  for (const char* name : {kVeltraUserInfoClientName, kVeltraUserInfoServiceName}) {
+  for (const char* name : {wire::kVeltraUserInfoClientName, wire::kVeltraUserInfoServiceName}) {
     if (const std::string* text = info.string(name)) bytes += 3 * text->size();
   }
   return bytes;
 }
 }  // namespace
 
-SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account) {
+backends::SharedDictionary keptInfo(Dictionary info,
+                                    const std::shared_ptr<platform::MemoryAccount>& account) {
   auto kept = std::make_shared<Kept>();
   if (account) {
     auto charge = account->keep(sizeof(Kept) + keptBytes(info) + keyBytes(info));
@@ -33,4 +34,4 @@ SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::Memor
   return {kept, &kept->info};
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -6,11 +6,11 @@
 #include "backends/backend.h"
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 // The dictionary, charged to `account` (null: to nobody) for as long as anybody holds it, with what is kept
 // of its names elsewhere. Null: the user keeps too much, even without what its batches hold. No lock may be
 // held.
-SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account);
+backends::SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account);
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -3,15 +3,16 @@
 
 #include "platform/clock.h"
 #include "platform/log.h"
-#include "protocol/constants.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
-void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& messageLog,
+void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog& messageLog,
                                 const OneShotMessage& message) {
-  const Value* given = message.sessionInfo ? message.sessionInfo->find(kVeltraSessionInfoSessionID) : nullptr;
+  const Value* given =
+      message.sessionInfo ? message.sessionInfo->find(wire::kVeltraSessionInfoSessionID) : nullptr;
   const std::int64_t number = given ? given->toInt64().value_or(0) : 0;
   logDebug("sendMessageWithSessionInfo: Sending single message with sessionID %ld", long{number});
   if (!message.sessionInfo || !message.storebag) {
@@ -25,7 +26,8 @@ void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& message
     logError("sendMessageWithSessionInfo: No backends available to send single message");
     return;
   }
-  if (message.userInfo && !message.sessionInfo->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false)) {
+  if (message.userInfo &&
+      !message.sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) {
     logWarning("sendMessageWithSessionInfo: user info provided without requiring it.");
   }
   const platform::TimeValue time = making.clock.now();
@@ -37,4 +39,4 @@ void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& message
   for (const auto& [name, backend] : *set) backend->cleanup();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -6,13 +6,15 @@
 
 #include "session/backend_set.h"
 
-namespace veltrad {
-
+namespace veltrad::support {
 class MessageLog;
+}  // namespace veltrad::support
+
+namespace veltrad::session {
 
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
-  SharedDictionary userInfo;  // null: none
+  backends::SharedDictionary userInfo;  // null: none
   const Dictionary* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
@@ -21,7 +23,7 @@ struct OneShotMessage {
 
 // Makes the back ends that the storebag names, lets each compute its state, hands each the message with flag
 // 0, logs what they answer, cleans them up. What they still have under way holds its own copies.
-void sendMessageWithSessionInfo(const BackendMaking& making, MessageLog& messageLog,
+void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog& messageLog,
                                 const OneShotMessage& message);
 
-}  // namespace veltrad
+}  // namespace veltrad::session

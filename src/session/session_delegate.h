@@ -9,7 +9,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 class VeltradSession;
 
@@ -42,4 +42,4 @@ class VeltradSessionDelegate {
   virtual std::string description() const = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -1,44 +1,44 @@
 // A session's messages: routing to the aggregating client and the backends, flushes, uploads.
 #include "backends/backend.h"
 #include "base/text.h"
+#include "ipc/connection.h"
 #include "platform/counters.h"
 #include "platform/log.h"
-#include "protocol/connection.h"
-#include "protocol/constants.h"
 #include "session/flush_counters.h"
 #include "session/one_shot.h"
 #include "session/session_delegate.h"
 #include "session/veltrad_session.h"
 #include "support/message_log.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                             OptionalDictionary payload, StringReply reply) {
+                                             wire::OptionalDictionary payload, wire::StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
   const auto answer = sendMessageWithCategory(category, type, std::move(payload));
   if (reply) reply(answer);
 }
 
-void VeltradSession::sendMessageWithDictionary(Dictionary message, StringReply reply) {
+void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", sessionID());
   const auto answer = sendMessageWithDictionary(message, Origin::client);
   if (reply) reply(answer);
 }
 
-void VeltradSession::finishSessionWithReply(StringReply reply) {
+void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
   logDebug("finishSessionWithReply: Finishing session %u", sessionID());
   const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
   if (reply) reply(answer);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                                                   OptionalDictionary payload,
+                                                                   wire::OptionalDictionary payload,
                                                                    Origin origin) {
-  Dictionary message{{kVeltraMessageParametersCategory, unsigned{category}},
-                     {kVeltraMessageParametersFlag, 0u},
-                     {kVeltraMessageParametersType, unsigned{type}}};
-  if (payload) message.set(kVeltraMessageParametersPayload, std::move(*payload));
+  Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
+                     {wire::kVeltraMessageParametersFlag, 0u},
+                     {wire::kVeltraMessageParametersType, unsigned{type}}};
+  if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
   return sendMessageWithDictionary(message, origin);
 }
 
@@ -52,13 +52,13 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
     }
     return std::nullopt;
   }
-  const auto category = message.uint32(kVeltraMessageParametersCategory);
+  const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
     _services.counters.count("message dropped: category is missing");
     return std::nullopt;
   }
-  const auto type = message.uint32(kVeltraMessageParametersType);
+  const auto type = message.uint32(wire::kVeltraMessageParametersType);
   if (!type) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
     _services.counters.count("message dropped: type is missing");
@@ -66,8 +66,8 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   }
   const auto category16 = static_cast<std::uint16_t>(*category);
   const auto type16 = static_cast<std::uint16_t>(*type);
-  const Dictionary* payload = message.dictionary(kVeltraMessageParametersPayload);
-  const auto flag = static_cast<std::int32_t>(message.uint32(kVeltraMessageParametersFlag).value_or(0));
+  const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
+  const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count("message taken in");
   sayWithoutUserInfo();
@@ -85,8 +85,8 @@ std::optional<std::string> VeltradSession::offerToBackends(const BackendSet& set
     auto answer = backend->sendMessage(payload, time, category, type, flag);
     if (!answer) continue;
     _services.messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", {name, *answer});
-    const bool replaces = backend->name() == kVeltraBackendHTTPPost;
-    const bool standsIn = backend->name() == kVeltraBackendDashboard && !result;
+    const bool replaces = backend->name() == wire::kVeltraBackendHTTPPost;
+    const bool standsIn = backend->name() == wire::kVeltraBackendDashboard && !result;
     if (replaces || standsIn) result = std::move(answer);
   }
   return result;
@@ -94,7 +94,7 @@ std::optional<std::string> VeltradSession::offerToBackends(const BackendSet& set
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, OptionalDictionary(payload), Origin::session);
+  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
@@ -106,12 +106,12 @@ void VeltradSession::sayWithoutUserInfo() {
   logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", sessionID());
 }
 
-void VeltradSession::aggregateMessage(const SharedDictionary& info, double timestamp, std::uint16_t category,
-                                      std::uint16_t type, const Dictionary* payload) {
-  const auto merged = [&]() -> OptionalDictionary {
+void VeltradSession::aggregateMessage(const backends::SharedDictionary& info, double timestamp,
+                                      std::uint16_t category, std::uint16_t type, const Dictionary* payload) {
+  const auto merged = [&]() -> wire::OptionalDictionary {
     if (!payload) return std::nullopt;
     Dictionary all = *payload;
-    if (const SharedDictionary mine = userInfo()) all.merge(*mine);
+    if (const backends::SharedDictionary mine = userInfo()) all.merge(*mine);
     return all;
   };
   std::optional<std::string> line;
@@ -126,10 +126,11 @@ void VeltradSession::aggregateMessage(const SharedDictionary& info, double times
   if (line) logError("%s", line->c_str());
 }
 
-std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictionary& info, double timestamp,
-                                                            std::uint16_t category, std::uint16_t type,
-                                                            OptionalDictionary payload) {
-  std::shared_ptr<Connection> connection;
+std::optional<std::string> VeltradSession::sendToAggregator(const backends::SharedDictionary& info,
+                                                            double timestamp, std::uint16_t category,
+                                                            std::uint16_t type,
+                                                            wire::OptionalDictionary payload) {
+  std::shared_ptr<ipc::Connection> connection;
   {
     const Lock held(_mutex);
     connection = _connection;
@@ -138,8 +139,8 @@ std::optional<std::string> VeltradSession::sendToAggregator(const SharedDictiona
   if (connection) {
     const auto proxy = connection->remoteObjectProxyWithErrorHandler(
         [&failure](const std::string& description) { failure = description; });
-    proxy->sendMessageToClient(info ? OptionalDictionary(*info) : std::nullopt, timestamp, category, type,
-                               std::move(payload));
+    proxy->sendMessageToClient(info ? wire::OptionalDictionary(*info) : std::nullopt, timestamp, category,
+                               type, std::move(payload));
   } else {
     failure = "The session has ended.";
     _services.counters.count("event dropped: the client has gone");
@@ -154,17 +155,17 @@ std::optional<std::string> VeltradSession::shutdownSessionAggregation() {
   return sendToAggregator(nullptr, 0, 0, 0, std::nullopt);
 }
 
-void VeltradSession::flushMessagesWithCompletion(FlushReply completion) {
+void VeltradSession::flushMessagesWithCompletion(wire::FlushReply completion) {
   logDebug("flushMessagesWithCompletion: Flushing messages for session %u", sessionID());
   internalFlushMessagesWithCompletion(std::move(completion));
 }
 
-void VeltradSession::internalFlushMessagesWithCompletion(FlushReply completion) {
+void VeltradSession::internalFlushMessagesWithCompletion(wire::FlushReply completion) {
   const auto set = backends();
   if (!set) {
     const char* text = "No backends available to send message";
     logDebug("internalFlushMessagesWithCompletion: %s", text);
-    if (completion) completion(std::nullopt, makeReportingError(text, -1));
+    if (completion) completion(std::nullopt, wire::makeReportingError(text, -1));
     return;
   }
   if (set->empty()) {
@@ -172,13 +173,13 @@ void VeltradSession::internalFlushMessagesWithCompletion(FlushReply completion) 
     return;
   }
   FlushCounters& flushes = _services.flushes;
-  MessageLog& messageLog = _services.messageLog;
+  support::MessageLog& messageLog = _services.messageLog;
   const auto flush = flushes.begin(set->size(), std::move(completion));
   for (const auto& [name, backend] : *set) {
     // Holds neither the session nor the backend: it may run on the HTTP thread, long after both have gone.
     backend->flushMessagesWithCompletion(
         [&flushes, &messageLog, flush, key = name, own = backend->name()](
-            const std::optional<std::string>& answer, const std::optional<ReportingError>& error) {
+            const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
           logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
           if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", {key, *answer});
           flushes.finished(*flush, answer, error);
@@ -187,7 +188,7 @@ void VeltradSession::internalFlushMessagesWithCompletion(FlushReply completion) 
 }
 
 void VeltradSession::uploadFileAtPath(std::string path, std::string extensionToken,
-                                      BooleanReply completionHandler) {
+                                      wire::BooleanReply completionHandler) {
   logDebug("uploadFileAtPath: Uploading file for session %u", sessionID());
   bool uploaded = false;
   if (const auto set = backends()) {
@@ -205,7 +206,7 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
   if (completionHandler) completionHandler(uploaded);
 }
 
-void VeltradSession::uploadLogData(Array logData, UploadLogDataReply completionHandler) {
+void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   bool uploaded = false;
   if (const auto set = backends()) {
     for (const auto& [name, backend] : *set) uploaded |= backend->uploadLogData(logData);
@@ -218,17 +219,19 @@ void VeltradSession::uploadLogData(Array logData, UploadLogDataReply completionH
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
 
-void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, OptionalDictionary userInfo,
-                                                std::uint16_t category, std::uint16_t type,
-                                                OptionalDictionary payload, StringReply reply) {
-  if (!info || !info->int32(kVeltraSessionInfoClientType) || !info->uint32(kVeltraSessionInfoSessionID)) {
+void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
+                                                wire::OptionalDictionary userInfo, std::uint16_t category,
+                                                std::uint16_t type, wire::OptionalDictionary payload,
+                                                wire::StringReply reply) {
+  if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
+      !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
     _services.counters.count("message dropped: a one-shot message without client type or session ID");
     return;  // the reply is never given, which ends the client's call
   }
-  _sessionID.store(info->uint32(kVeltraSessionInfoSessionID).value_or(0), std::memory_order_relaxed);
-  SharedDictionary kept;
-  SharedDictionary identity;
+  _sessionID.store(info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0), std::memory_order_relaxed);
+  backends::SharedDictionary kept;
+  backends::SharedDictionary identity;
   if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
     _services.counters.count("message dropped: its user keeps too much");
     return;
@@ -236,18 +239,18 @@ void VeltradSession::sendMessageWithSessionInfo(OptionalDictionary info, Optiona
   keepSessionInfo(kept);
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
-  const SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count("message dropped: no storebag for a one-shot message");
     if (reply) reply("storebag not available");
     return;
   }
   _services.counters.count("message taken in: one-shot");
-  veltrad::sendMessageWithSessionInfo(
+  veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _account, true},
       _services.messageLog,
       {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
   if (reply) reply("finished");
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -3,12 +3,12 @@
 
 #include "platform/locale.h"
 #include "platform/preferences.h"
-#include "protocol/veltra.h"
 #include "support/device_identity.h"
+#include "support/veltra.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
-Dictionary startMessagePayload(DeviceIdentity& device, const Veltra& library,
+Dictionary startMessagePayload(support::DeviceIdentity& device, const support::Veltra& library,
                                platform::Preferences& preferences, platform::Locale& locale) {
   const auto automatic = preferences.value("com.florn.timed", "TMAutomaticTimeZoneEnabled");
   Dictionary payload{{"AutomaticTimeSet", automatic ? automatic->toBoolean().value_or(true) : true}};
@@ -27,4 +27,4 @@ Dictionary startMessagePayload(DeviceIdentity& device, const Veltra& library,
   return payload;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -4,17 +4,17 @@
 #include <fmt/format.h>
 
 #include "base/base64.h"
+#include "ipc/connection.h"
 #include "platform/counters.h"
 #include "platform/log.h"
 #include "platform/uuid.h"
-#include "protocol/connection.h"
-#include "protocol/constants.h"
 #include "session/kept_info.h"
 #include "session/session_delegate.h"
 #include "session/start_message.h"
 #include "support/device_identity.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::session {
 
 namespace {
 // String equality of the names that make an identity; a name missing on the new side counts as a change.
@@ -32,7 +32,7 @@ std::string newSessionIDString() {
 
 std::shared_ptr<VeltradSession> VeltradSession::initWithSessionDelegate(
     const SessionServices& services, VeltradSessionDelegate& delegate,
-    std::shared_ptr<Connection> connection) {
+    std::shared_ptr<ipc::Connection> connection) {
   logDebug("initWithSessionDelegate: VeltradSession initWithSessionDelegate:%s",
            delegate.description().c_str());
   std::shared_ptr<VeltradSession> session(
@@ -42,7 +42,7 @@ std::shared_ptr<VeltradSession> VeltradSession::initWithSessionDelegate(
 }
 
 VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
-                               std::shared_ptr<Connection> connection, std::string sessionIDString)
+                               std::shared_ptr<ipc::Connection> connection, std::string sessionIDString)
     : _services(services),
       _sessionDelegate(delegate),
       _sessionIDString(std::move(sessionIDString)),
@@ -62,12 +62,12 @@ std::optional<std::string> VeltradSession::storebagVersion() const {
   return _storebagVersion;
 }
 
-SharedDictionary VeltradSession::sessionInfo() const {
+backends::SharedDictionary VeltradSession::sessionInfo() const {
   const Lock held(_mutex);
   return _sessionInfo;
 }
 
-SharedDictionary VeltradSession::userInfo() const {
+backends::SharedDictionary VeltradSession::userInfo() const {
   const Lock held(_mutex);
   return _userInfo;
 }
@@ -82,19 +82,19 @@ std::string VeltradSession::deviceID() const {
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {
-  const SharedDictionary info = sessionInfo();
-  return info ? info->int32(kVeltraSessionInfoClientType) : std::nullopt;
+  const backends::SharedDictionary info = sessionInfo();
+  return info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
 }
 
-bool VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
+bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                     std::optional<Array>, bool hasAggregationBlock) {
-  SharedDictionary info;
-  SharedDictionary identity;
+  backends::SharedDictionary info;
+  backends::SharedDictionary identity;
   if (!charged(std::move(sessionInfo), info) || !charged(std::move(userInfo), identity)) return false;
-  const std::uint32_t number = info ? info->uint32(kVeltraSessionInfoSessionID).value_or(0) : 0;
+  const std::uint32_t number = info ? info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0) : 0;
   _sessionID.store(number, std::memory_order_relaxed);
   logDebug("setSessionInfo: Configuring session %u", number);
-  const bool required = info && info->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false);
+  const bool required = info && info->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
   if (identity && !required) {
     logWarning("setSessionInfo: Configure session: user info provided without requiring it");
   }
@@ -104,27 +104,27 @@ bool VeltradSession::setSessionInfo(OptionalDictionary sessionInfo, OptionalDict
   return true;
 }
 
-bool VeltradSession::charged(OptionalDictionary given, SharedDictionary& kept) {
+bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDictionary& kept) {
   if (!given) return true;
   kept = keptInfo(std::move(*given), _account);
   if (!kept) _services.counters.count("session or user info refused: its user keeps too much");
   return kept != nullptr;
 }
 
-void VeltradSession::keepSessionInfo(SharedDictionary info) {
+void VeltradSession::keepSessionInfo(backends::SharedDictionary info) {
   const Lock held(_mutex);
   _sessionInfo.swap(info);
 }
 
-void VeltradSession::keepUserInfo(SharedDictionary info) {
+void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
   const Lock held(_mutex);
   _userInfo.swap(info);
 }
 
-void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandler) {
+void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
-  const SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count("start without back ends: no storebag");
     if (completionHandler) completionHandler(std::nullopt);
@@ -143,7 +143,7 @@ void VeltradSession::startConfigWithCompletionHandler(NamesReply completionHandl
 
 void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
-  const SharedDictionary info = sessionInfo();
+  const backends::SharedDictionary info = sessionInfo();
   // It may have been out of reach when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
   auto made =
@@ -185,7 +185,7 @@ void VeltradSession::updateReportingStates() {
 }
 
 void VeltradSession::updateUserInfoForBackends() {
-  const SharedDictionary info = userInfo();
+  const backends::SharedDictionary info = userInfo();
   if (const auto set = backends()) {
     for (const auto& [name, backend] : *set) backend->setUserInfoDict(info);
   }
@@ -197,22 +197,24 @@ std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() c
   return reportingNames(*set);
 }
 
-void VeltradSession::fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) {
+void VeltradSession::fetchStatesWithUserInfo(wire::OptionalDictionary userInfo,
+                                             wire::NamesReply completionHandler) {
   logDebug("fetchStatesWithUserInfo: Fetching states for session %u", sessionID());
-  SharedDictionary identity;
+  backends::SharedDictionary identity;
   if (charged(std::move(userInfo), identity)) receivedUserInfo(std::move(identity));
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::receivedUserInfo(SharedDictionary updated) {
-  const SharedDictionary current = userInfo();
+void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
+  const backends::SharedDictionary current = userInfo();
   if (!updated) {
     if (!current) return;
-    const SharedDictionary info = sessionInfo();
-    if (info && info->boolean(kVeltraSessionInfoRequireUserInfo).value_or(false)) return;
+    const backends::SharedDictionary info = sessionInfo();
+    if (info && info->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) return;
   }
-  const bool unchanged = current && updated && sameName(*current, *updated, kVeltraUserInfoClientName) &&
-                         sameName(*current, *updated, kVeltraUserInfoServiceName);
+  const bool unchanged = current && updated &&
+                         sameName(*current, *updated, wire::kVeltraUserInfoClientName) &&
+                         sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
   const auto take = [this, &updated] {
     keepUserInfo(std::move(updated));
     updateUserInfoForBackends();
@@ -227,11 +229,12 @@ void VeltradSession::receivedUserInfo(SharedDictionary updated) {
   refreshStates();
 }
 
-void VeltradSession::fetchDisplayURL(StringReply reply) {
+void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
   logDebug("fetchDisplayURL: Fetching display URL for session %u", sessionID());
   std::string url = "URL not available";
   if (const auto set = backends()) {
-    for (const char* name : {kVeltraBackendHTTPPost, kVeltraBackendHTTPPost2, kVeltraBackendDashboard}) {
+    for (const char* name :
+         {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendDashboard}) {
       const auto at = set->find(name);
       const auto display = at == set->end() ? std::nullopt : at->second->displayURL();
       if (!display) continue;
@@ -245,7 +248,7 @@ void VeltradSession::fetchDisplayURL(StringReply reply) {
 std::int32_t VeltradSession::getSessionHierarchy() const {
   const auto set = backends();
   if (!set) return 0;
-  for (const char* name : {kVeltraBackendHTTPPost2, kVeltraBackendHTTPPost}) {
+  for (const char* name : {wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendHTTPPost}) {
     const auto at = set->find(name);
     if (at != set->end()) return at->second->hierarchy();
   }
@@ -265,10 +268,10 @@ void VeltradSession::syncReportingStates() {
       }
       continue;
     }
-    if (backend->state() == kBackendHeld) continue;
+    if (backend->state() == backends::kBackendHeld) continue;
     const auto at = theirs ? theirs->find(name) : BackendSet::const_iterator();
     if (!theirs || at == theirs->end()) {
-      backend->setState(kBackendDisabled);
+      backend->setState(backends::kBackendDisabled);
       continue;
     }
     backend->setState(at->second->state());
@@ -299,7 +302,7 @@ void VeltradSession::end() {
   // Nobody sends to this client any more: the invalidation has taken the session from its list.
   if (const auto line = _dropLine.rest()) logError("%s", line->c_str());
   std::shared_ptr<const BackendSet> released;
-  std::shared_ptr<Connection> connection;  // may be the last reference: goes after the lock
+  std::shared_ptr<ipc::Connection> connection;  // may be the last reference: goes after the lock
   {
     const Lock held(_mutex);
     released.swap(_backends);
@@ -313,4 +316,4 @@ void VeltradSession::end() {
   }
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::session

@@ -3,7 +3,7 @@
 
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::support {
 
 namespace {
 
@@ -90,4 +90,4 @@ bool Deflation::failed(int result) const {
   return true;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::support

@@ -8,7 +8,7 @@
 #include <string>
 #include <string_view>
 
-namespace veltrad {
+namespace veltrad::support {
 
 // Takes the next bytes of an output. False: it can take no more, and a line has said why.
 using ByteSink = std::function<bool(std::string_view bytes)>;
@@ -36,4 +36,4 @@ class Deflation {
   bool _begun = false;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::support

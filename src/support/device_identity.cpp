@@ -5,7 +5,7 @@
 
 #include "platform/device_properties.h"
 
-namespace veltrad {
+namespace veltrad::support {
 
 std::optional<std::string> DeviceIdentity::deviceProductVersion() {
   return value("ProductVersion");
@@ -55,4 +55,4 @@ std::optional<std::string> DeviceIdentity::value(std::string_view key) {
   return answer ? answer.value() : std::nullopt;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::support

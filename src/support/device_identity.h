@@ -8,11 +8,11 @@
 
 #include "base/mutex.h"
 
-namespace veltrad {
-
-namespace platform {
+namespace veltrad::platform {
 class DeviceProperties;
-}
+}  // namespace veltrad::platform
+
+namespace veltrad::support {
 
 // Asks the device property service under fixed keys. Nothing is cached but whether the build is an internal
 // one. What the service cannot say for now is nothing, and is not remembered. The service must outlive it.
@@ -50,4 +50,4 @@ class DeviceIdentity {
   std::optional<bool> _internalBuild GUARDED_BY(_mutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::support

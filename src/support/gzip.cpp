@@ -7,7 +7,7 @@
 
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::support {
 namespace {
 
 constexpr std::size_t kPieceBytes = 128u << 10;
@@ -115,4 +115,4 @@ bool gzipDeflate(const ByteSource& source, const ByteSink& sink) {
   }
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::support

@@ -9,7 +9,7 @@
 
 #include "support/deflation.h"
 
-namespace veltrad {
+namespace veltrad::support {
 
 // The gzip stream (RFC 1952) of `bytes`; nothing, after an error line, where there are none, memory is short
 // or zlib fails.
@@ -26,4 +26,4 @@ bool gzipDeflate(const ByteSource& source, const ByteSink& sink);
 // The same of whole bytes with the wrapper chosen: gzip (true) or zlib's own (false, RFC 1950).
 std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view bytes);
 
-}  // namespace veltrad
+}  // namespace veltrad::support

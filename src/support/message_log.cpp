@@ -18,7 +18,7 @@
 #include "platform/file_store.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::support {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
@@ -160,4 +160,4 @@ void MessageLogFile::remove(const LogFile& file) {
           createdText(file.created).c_str());
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::support

@@ -10,12 +10,12 @@
 #include "platform/disk_writer.h"
 #include "support/open_log_file.h"
 
-namespace veltrad {
-
-namespace platform {
+namespace veltrad::platform {
 class Clock;
 class Counters;
-}  // namespace platform
+}  // namespace veltrad::platform
+
+namespace veltrad::support {
 
 class MessageLog {
  public:
@@ -65,4 +65,4 @@ std::string filledFormat(std::string_view format, std::initializer_list<std::str
 // "2014-11-16 20:13:54 +0000"
 std::string dateDescription(double secondsSince1970);
 
-}  // namespace veltrad
+}  // namespace veltrad::support

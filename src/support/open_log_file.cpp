@@ -8,7 +8,7 @@
 #include <algorithm>
 #include <charconv>
 
-namespace veltrad {
+namespace veltrad::support {
 
 namespace {
 constexpr std::string_view kPrefix = "veltrad_";
@@ -89,4 +89,4 @@ bool OpenLogFile::append(const std::string& line) const {
   return write(_file.get(), line.data(), line.size()) == static_cast<ssize_t>(line.size());
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::support

@@ -8,9 +8,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
-namespace veltrad {
+namespace veltrad::support {
 
 // What tells whether names came to or went from a directory since it was looked at.
 struct DirectoryState {
@@ -41,7 +41,7 @@ class OpenLogFile {
   bool append(const std::string& line) const;
 
  private:
-  platform::FileDescriptor _file;
+  FileDescriptor _file;
   std::string _path;
   std::optional<DirectoryState> _listed;
 };
@@ -54,4 +54,4 @@ std::optional<double> creationDate(int file, const std::string& path);
 // The part between the underscores of a name that is one of the daemon's log files.
 std::optional<std::string_view> secondsInLogFileName(std::string_view name);
 
-}  // namespace veltrad
+}  // namespace veltrad::support

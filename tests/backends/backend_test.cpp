@@ -9,9 +9,9 @@ namespace veltrad {
 namespace {
 
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
-  struct Counting final : VeltraBackend {
-    explicit Counting(platform::Random& random) : VeltraBackend("x", {}, "", random) {}
-    using VeltraBackend::sendMessage;
+  struct Counting final : backends::VeltraBackend {
+    explicit Counting(platform::Random& random) : backends::VeltraBackend("x", {}, "", random) {}
+    using backends::VeltraBackend::sendMessage;
     std::optional<std::string> sendMessage(const Dictionary*, platform::TimeValue, std::uint16_t,
                                            std::uint16_t, std::uint16_t eventID, std::int32_t) override {
       return std::to_string(eventID);
@@ -29,7 +29,7 @@ TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
     EXPECT_EQ(backend->selfVersionMajor(), major) << text;
     EXPECT_EQ(backend->selfVersionMinor(), minor) << text;
   }
-  EXPECT_EQ(VeltraBackend::convertIntoSHA256("").substr(0, 8), "e3b0c442");
+  EXPECT_EQ(backends::VeltraBackend::convertIntoSHA256("").substr(0, 8), "e3b0c442");
 }
 
 }  // namespace

@@ -6,14 +6,14 @@
 
 #include "backends/backend.h"
 #include "backends/https/filter_table.h"
-#include "base/json.h"
+#include "formats/json.h"
 
 namespace veltrad {
 namespace {
 
 TEST(ClientDecision, HoldsAtItsBorders) {
-  const ClientFacts facts{true, "DE", "Desktop", "Workbench 3", 0.3};
-  ClientFacts nowhere = facts, nothing = facts;
+  const backends::ClientFacts facts{true, "DE", "Desktop", "Workbench 3", 0.3};
+  backends::ClientFacts nowhere = facts, nothing = facts;
   nowhere.country.reset();
   nothing.hardwareType.reset();
   const Value equal(0.3), below(0.25);
@@ -22,8 +22,8 @@ TEST(ClientDecision, HoldsAtItsBorders) {
                  Dictionary{{"country", Array{"AT", "DE"}}, {"threshold", std::move(threshold)}},
                  Dictionary{{"country", Array{"DE"}}, {"threshold", 0.0}}};
   };
-  using enum ClientRefusal;
-  const std::tuple<Dictionary, ClientFacts, std::int32_t, ClientRefusal> cases[] = {
+  using enum backends::ClientRefusal;
+  const std::tuple<Dictionary, backends::ClientFacts, std::int32_t, backends::ClientRefusal> cases[] = {
       {{}, nowhere, 2, none},
       {{{"device_blacklist", Array{"x"}}}, nothing, 1, deviceListed},
       {{{"sampling_threshold", equal}}, facts, 2, none},
@@ -35,9 +35,9 @@ TEST(ClientDecision, HoldsAtItsBorders) {
   for (const auto& [changes, who, state, refusal] : cases) {
     Dictionary entry{{"locale_whitelist", Array{"de"}}, {"filters", Array{}}, {"sampling_threshold", 0.5}};
     entry.merge(changes);
-    const ClientVerdict verdict = decideOnClient(entry, who);
-    EXPECT_EQ(verdict.state, state) << writeJSON(changes);
-    EXPECT_EQ(verdict.refusal, refusal) << writeJSON(changes);
+    const backends::ClientVerdict verdict = backends::decideOnClient(entry, who);
+    EXPECT_EQ(verdict.state, state) << formats::writeJSON(changes);
+    EXPECT_EQ(verdict.refusal, refusal) << formats::writeJSON(changes);
   }
 }
 
@@ -55,14 +55,14 @@ TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
       {{Dictionary{{"action", "remove"}}, "junk"}, event, event},
       {{filter("n", "remove", {{"method", 0}, {"status", 0}})}, {{"n", 1}}, {}}};
   for (const auto& [filters, before, after] : rows) {
-    FilterTable table;
+    backends::FilterTable table;
     table.createFiltersFromArray(filters);
     table.createFiltersFromArray({});
     Dictionary filtered = before;
     table.filterEvent(filtered);
-    EXPECT_EQ(filtered, after) << writeJSON(filters);
+    EXPECT_EQ(filtered, after) << formats::writeJSON(filters);
   }
-  FilterTable table;
+  backends::FilterTable table;
   table.createFiltersFromArray({filter("mac", "remove")});
   table.createFiltersFromArray({filter("other", "remove")});
   Dictionary kept = event;

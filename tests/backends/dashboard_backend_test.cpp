@@ -8,12 +8,12 @@
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
+#include "base/file_descriptor.h"
 #include "fakes/few_descriptors.h"
 #include "fakes/recorded_log.h"
 #include "fakes/world.h"
-#include "platform/file_descriptor.h"
 #include "platform/memory_budget.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
 namespace veltrad {
 namespace {
@@ -27,7 +27,7 @@ constexpr platform::TimeValue kTime{1'400'000'000, 123'456};
 // A dashboard on loopback. Whoever waits for a datagram in vain gets none after 10 s.
 struct DashboardServer {
   DashboardServer() : socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
-    auto address = *platform::parseIPv4Address("127.0.0.1", 0);
+    auto address = *backends::parseIPv4Address("127.0.0.1", 0);
     socklen_t size = sizeof address;
     const timeval patience{10, 0};
     ::setsockopt(socket.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
@@ -40,20 +40,21 @@ struct DashboardServer {
     const auto length = ::recv(socket.get(), bytes, sizeof bytes, 0);
     return length < 0 ? "nothing came"s : std::string(bytes, static_cast<std::size_t>(length));
   }
-  platform::FileDescriptor socket;
+  FileDescriptor socket;
   std::uint16_t port = 0;
 };
 
 class Dashboard : public ::testing::Test {
  protected:
-  std::shared_ptr<VeltraBackend> make(const Dictionary& more = {}, const BackendOwner& owner = {}) {
+  std::shared_ptr<backends::VeltraBackend> make(const Dictionary& more = {},
+                                                const backends::BackendOwner& owner = {}) {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", unsigned{server.port}}};
     profile.merge(more);
     return configured(
-        world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7, owner));
+        world.factory.newBackendWithName(wire::kVeltraBackendDashboard, profile, "Desktop", 7, owner));
   }
   // A message that nobody acknowledges, and the end of its back end.
-  void sendAndEnd(const BackendOwner& owner) {
+  void sendAndEnd(const backends::BackendOwner& owner) {
     const auto backend = make({{"reliable", 60'000}}, owner);
     backend->sendMessage(nullptr, kTime, 1, 1, 0);
     backend->cleanup();
@@ -62,7 +63,7 @@ class Dashboard : public ::testing::Test {
     const std::filesystem::directory_iterator all(directory);
     return std::distance(begin(all), end(all));
   }
-  std::shared_ptr<VeltraBackend> configured(std::shared_ptr<VeltraBackend> backend) {
+  std::shared_ptr<backends::VeltraBackend> configured(std::shared_ptr<backends::VeltraBackend> backend) {
     backend->setCompType(7);
     backend->setSessionID(4660);
     backend->setClientVersion(3);
@@ -76,10 +77,12 @@ class Dashboard : public ::testing::Test {
 };
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
-  LogDataUploads uploads(world.http, world.counters);
-  const DashboardMaking making{world.services, uploads, std::make_shared<DashboardQueues>(), {}};
-  const auto direct = DashboardBackend::initWithName(making, "direct", "127.0.0.1"s, server.port, "Desktop");
-  const std::pair<std::shared_ptr<VeltraBackend>, char> cases[] = {
+  backends::LogDataUploads uploads(world.http, world.counters);
+  const backends::DashboardMaking making{
+      world.services, uploads, std::make_shared<backends::DashboardQueues>(), {}};
+  const auto direct =
+      backends::DashboardBackend::initWithName(making, "direct", "127.0.0.1"s, server.port, "Desktop");
+  const std::pair<std::shared_ptr<backends::VeltraBackend>, char> cases[] = {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
   for (const auto& [backend, flags] : cases) {
@@ -157,11 +160,11 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   EXPECT_EQ(world.counters.value("datagram sent"), 25u);
 
   const FewDescriptors none;
-  std::vector<std::shared_ptr<VeltraBackend>> made;
+  std::vector<std::shared_ptr<backends::VeltraBackend>> made;
   for (int i = 0; i < 3; ++i) made.push_back(make({}, {account}));
   log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
   const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
-  EXPECT_EQ(world.factory.newBackendWithName(kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
+  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
 }
 
 }  // namespace

@@ -12,7 +12,7 @@ namespace veltrad {
 namespace {
 
 using namespace std::chrono_literals;
-using Verdict = DeliverySchedule::Verdict;
+using Verdict = backends::DeliverySchedule::Verdict;
 
 // A network that takes datagrams on some ticks only; the first transmission is tick 0.
 struct Network {
@@ -22,7 +22,7 @@ struct Network {
   std::vector<int> sentAt;
   std::vector<std::string> sent;
 
-  MessageQueue::Send send() {
+  backends::MessageQueue::Send send() {
     return [this](std::string_view datagram) {
       if (closed.contains(now)) return false;
       sentAt.push_back(now);
@@ -46,7 +46,7 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
                          {false, {}, {0}, 0},                       // sent is done
                          {false, {0, 1, 2}, {3}, 3}}) {
     Network network(c.closed);
-    MessageQueue queue(c.reliable, false, network.send());
+    backends::MessageQueue queue(c.reliable, false, network.send());
     EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).sent, !c.closed.contains(0));
     std::size_t givenUp = 0;
     while (!queue.empty() && network.now < 100) {
@@ -62,7 +62,7 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
 TEST(DashboardDelivery, SoManyWaitAndTheOldestMakesRoom) {
   for (const auto& [shared, most] : {std::pair{false, 50}, {true, 1024}}) {
     Network network({0});
-    MessageQueue queue(false, shared, network.send());
+    backends::MessageQueue queue(false, shared, network.send());
     EXPECT_TRUE(queue.tryToSendMsg("nobody pays", 0, std::nullopt).notKept);
     for (int event = 0; event <= most; ++event) {
       EXPECT_EQ(queue.tryToSendMsg(std::to_string(event), 1, platform::Charge()).pushedOut, event == most);
@@ -77,7 +77,7 @@ TEST(DashboardDelivery, SoManyWaitAndTheOldestMakesRoom) {
 
 TEST(DashboardDelivery, AnAcknowledgementRemovesTheOldestOfItsNumber) {
   Network network({1});
-  MessageQueue queue(true, false, network.send());
+  backends::MessageQueue queue(true, false, network.send());
   for (const char* datagram : {"older", "other", "newer"}) {
     queue.tryToSendMsg(datagram, datagram == std::string("other") ? 8 : 7,
                        platform::Charge());  // 7 has come round again
@@ -111,7 +111,7 @@ TEST(DashboardDelivery, AnAcknowledgementOfASharedNumberAnswersOneCopy) {
            {"A..!..........B!", ""},  // on the 12th no more
            {"A!!B", "B"}}) {
     Network network({});
-    MessageQueue queue(true, true, network.send());
+    backends::MessageQueue queue(true, true, network.send());
     for (const char step : c.story) {
       if (step == '.') {
         queue.tick();
@@ -132,8 +132,8 @@ TEST(DashboardDelivery, AnAcknowledgementOfASharedNumberAnswersOneCopy) {
 }
 
 TEST(DashboardDelivery, TicksStandAtMultiplesAndOnlyWhileSomethingWaits) {
-  const DeliverySchedule::Time made{1h};
-  DeliverySchedule schedule(made, 250ms);
+  const backends::DeliverySchedule::Time made{1h};
+  backends::DeliverySchedule schedule(made, 250ms);
   EXPECT_EQ(schedule.next(made + 10ms, false), std::nullopt);
   EXPECT_FALSE(schedule.tickIsDue(made + 1h));
   for (const auto& [now, next] : std::vector<std::pair<std::chrono::milliseconds, std::chrono::milliseconds>>{
@@ -145,11 +145,11 @@ TEST(DashboardDelivery, TicksStandAtMultiplesAndOnlyWhileSomethingWaits) {
 }
 
 TEST(DashboardDelivery, CleanUpWaitsForDatagramsUntilTheLastResort) {
-  const DeliverySchedule::Time made{};
-  DeliverySchedule idle(made, 500ms);
+  const backends::DeliverySchedule::Time made{};
+  backends::DeliverySchedule idle(made, 500ms);
   EXPECT_EQ(idle.cleanup(false), Verdict::stop);
 
-  DeliverySchedule schedule(made, 500ms);
+  backends::DeliverySchedule schedule(made, 500ms);
   EXPECT_EQ(schedule.afterTick(made + 500ms, false), Verdict::goOn);
   EXPECT_EQ(schedule.cleanup(true), Verdict::goOn);
   EXPECT_EQ(schedule.next(made + 600ms, false), made + 1000ms);  // acknowledged since, but not stopped

@@ -14,23 +14,23 @@ Dictionary event(int number) {
 }
 std::size_t charged(const std::vector<Dictionary>& events) {
   std::size_t sum = 0;
-  for (const Dictionary& one : events) sum += sizeOfEvent(one).charged;
+  for (const Dictionary& one : events) sum += backends::sizeOfEvent(one).charged;
   return sum;
 }
 
 TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
-  EventBatch batch;
-  const EventSize half{EventBatch::kMostBytes / 2, 10};
-  EXPECT_FALSE(batch.full({EventBatch::kMostBytes, 0}));
-  EXPECT_TRUE(batch.full({EventBatch::kMostBytes + 1, 0}));
+  backends::EventBatch batch;
+  const backends::EventSize half{backends::EventBatch::kMostBytes / 2, 10};
+  EXPECT_FALSE(batch.full({backends::EventBatch::kMostBytes, 0}));
+  EXPECT_TRUE(batch.full({backends::EventBatch::kMostBytes + 1, 0}));
   batch.add(5, event(0), half, 7);
   EXPECT_FALSE(batch.full(half));
   EXPECT_TRUE(batch.full({half.json + 1, 0}));
   batch.dropOldest();
   batch.dropOldest();  // of none
   EXPECT_EQ(batch.chargedBytes(), 0u);
-  const EventSize small = sizeOfEvent(event(1));
-  for (std::size_t i = 0; i < EventBatch::kMostEvents; ++i) {
+  const backends::EventSize small = backends::sizeOfEvent(event(1));
+  for (std::size_t i = 0; i < backends::EventBatch::kMostEvents; ++i) {
     ASSERT_FALSE(batch.full(small));
     batch.add(i % 2 == 0 ? 5 : 6, event(1), small, i);
   }
@@ -51,17 +51,17 @@ TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
   EXPECT_TRUE(!batch.thresholdReached(6, 0) && batch.size() == 0 && !batch.oldestTurn());
   Dictionary renamed = event(1);
   renamed.set("_sessionID", "a much longer one than before");
-  EXPECT_EQ(sum, charged(std::vector(EventBatch::kMostEvents - 1, renamed)));
+  EXPECT_EQ(sum, charged(std::vector(backends::EventBatch::kMostEvents - 1, renamed)));
 }
 
 TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   platform::Counters counters;
-  const EventSize size = sizeOfEvent(event(1));
+  const backends::EventSize size = backends::sizeOfEvent(event(1));
   platform::MemoryBounds bounds;
   bounds.userKept = 3 * size.charged;
   platform::MemoryBudget budget(bounds);
   const auto account = budget.accountOf(1);
-  const auto held = std::make_shared<HeldEvents>(counters);
+  const auto held = std::make_shared<backends::HeldEvents>(counters);
   account->add(held);
   const auto add = [&](int number, std::uint64_t built) {
     auto charge = account->keep(size.charged);
@@ -86,10 +86,11 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   EXPECT_EQ(numbers, "3new 4new 5new ");
   taken.charge.release();
   add(6, held->sessionIDChanges());
-  EXPECT_EQ(held->needOf(5, 0, size), HeldEvents::Need::flush);
-  EXPECT_EQ(held->needOf(5, 1, size), HeldEvents::Need::room);
-  EXPECT_EQ(held->needOf(5, 1, {EventBatch::kMostBytes, 0}), HeldEvents::Need::bound);
-  held->add(5, event(7), {EventBatch::kMostBytes, size.charged}, *account->keep(size.charged), 9, 2);
+  EXPECT_EQ(held->needOf(5, 0, size), backends::HeldEvents::Need::flush);
+  EXPECT_EQ(held->needOf(5, 1, size), backends::HeldEvents::Need::room);
+  EXPECT_EQ(held->needOf(5, 1, {backends::EventBatch::kMostBytes, 0}), backends::HeldEvents::Need::bound);
+  held->add(5, event(7), {backends::EventBatch::kMostBytes, size.charged}, *account->keep(size.charged), 9,
+            2);
   EXPECT_EQ(counters.value("event dropped: the batch is full"), 1u);
   EXPECT_EQ(held->discard(), 1u);
   EXPECT_EQ(account->used(), 0u);

@@ -11,8 +11,8 @@
 
 #include "backends/upload/file_snapshot.h"
 #include "backends/upload/file_uploads.h"
+#include "base/file_descriptor.h"
 #include "fakes/temporary_directory.h"
-#include "platform/file_descriptor.h"
 
 namespace veltrad {
 namespace {
@@ -21,40 +21,40 @@ TEST(FileSnapshot, EndsWhereTheFileEndedAtFirst) {
   TemporaryDirectory directory;
   const std::string path = directory.path() + "/file";
   std::ofstream(path) << "0123456789";
-  const platform::FileDescriptor file(::open(path.c_str(), O_RDWR | O_CLOEXEC));
-  const auto readAll = [&](FileSnapshot& snapshot) {
+  const FileDescriptor file(::open(path.c_str(), O_RDWR | O_CLOEXEC));
+  const auto readAll = [&](backends::FileSnapshot& snapshot) {
     std::string all;
     char piece[4];
     while (const auto count = snapshot.read(piece, sizeof piece).value_or(0)) all.append(piece, count);
     return all;
   };
-  auto whole = FileSnapshot::of(file.get());
+  auto whole = backends::FileSnapshot::of(file.get());
   ASSERT_TRUE(whole && readAll(*whole) == "0123456789" && !whole->changed());
-  auto grown = FileSnapshot::of(file.get());
+  auto grown = backends::FileSnapshot::of(file.get());
   std::ofstream(path, std::ios::app) << "more";
   EXPECT_TRUE(readAll(*grown) == "0123456789" && grown->changed());
-  auto shrunk = FileSnapshot::of(file.get());
+  auto shrunk = backends::FileSnapshot::of(file.get());
   ASSERT_EQ(::ftruncate(file.get(), 6), 0);
   EXPECT_TRUE(readAll(*shrunk) == "012345" && shrunk->changed());
   // Short for a while only, which nobody but the reader has seen.
-  auto cut = FileSnapshot::of(file.get());
+  auto cut = backends::FileSnapshot::of(file.get());
   struct stat facts {};
   ASSERT_TRUE(::fstat(file.get(), &facts) == 0 && ::ftruncate(file.get(), 3) == 0);
   EXPECT_EQ(readAll(*cut), "012");
   const timespec times[] = {facts.st_atim, facts.st_mtim};
   ASSERT_TRUE(::ftruncate(file.get(), facts.st_size) == 0 && ::futimens(file.get(), times) == 0);
   EXPECT_TRUE(cut->changed());
-  auto emptied = FileSnapshot::of(file.get());
+  auto emptied = backends::FileSnapshot::of(file.get());
   ASSERT_EQ(::ftruncate(file.get(), 0), 0);
-  EXPECT_EQ(emptied->content(), FileSnapshot::Content::none);
+  EXPECT_EQ(emptied->content(), backends::FileSnapshot::Content::none);
 }
 
 // Asked by each who waits, after he has taken his place in the row.
-struct Stoppable final : platform::HTTPClient {
-  std::optional<platform::HTTPError> start(platform::HTTPRequest, platform::HTTPCompletion) override {
+struct Stoppable final : http::HTTPClient {
+  std::optional<http::HTTPError> start(http::HTTPRequest, http::HTTPCompletion) override {
     return std::nullopt;
   }
-  platform::HTTPResult perform(platform::HTTPRequest) override { return Failure{platform::HTTPError{}}; }
+  http::HTTPResult perform(http::HTTPRequest) override { return Failure{http::HTTPError{}}; }
   bool stopping() const override {
     ++asked;
     return stop;
@@ -65,9 +65,9 @@ struct Stoppable final : platform::HTTPClient {
 
 // Who waits is let in by order of arrival, but for the share of his user; a stop ends every wait.
 TEST(FileUploads, OneUserLeavesAPlaceToOthers) {
-  FileUploads uploads;
+  backends::FileUploads uploads;
   Stoppable http;
-  using Place = std::optional<FileUploads::Place>;
+  using Place = std::optional<backends::FileUploads::Place>;
   auto first = std::make_unique<Place>(uploads.enter(1, http));
   const Place second = uploads.enter(1, http);
   std::atomic<bool> entered{false}, turnedAway{false};

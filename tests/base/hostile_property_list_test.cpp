@@ -4,8 +4,8 @@
 #include <ctime>
 #include <fstream>
 
-#include "base/property_list.h"
 #include "binary_list_builder.h"
+#include "formats/property_list.h"
 
 #if defined(__has_feature)
 #if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
@@ -127,7 +127,7 @@ TEST(HostilePropertyList, endsInTimeAndMemory) {
     SCOPED_TRACE(name);
     ASSERT_LT(bytes.size(), 1u << 20);
     const double start = cpuSeconds();
-    const auto read = parsePropertyList(bytes);
+    const auto read = formats::parsePropertyList(bytes);
     EXPECT_LT(cpuSeconds() - start, kMostSeconds);
     EXPECT_TRUE(mostKilobytes() - before < (16 << 10) || !kMeasuresMemory) << mostKilobytes() - before;
     if (kind) {

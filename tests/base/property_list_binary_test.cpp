@@ -4,9 +4,9 @@
 #include <numeric>
 #include <sstream>
 
-#include "base/json.h"
-#include "base/property_list.h"
 #include "binary_list_builder.h"
+#include "formats/json.h"
+#include "formats/property_list.h"
 
 namespace veltrad {
 namespace {
@@ -31,14 +31,14 @@ TEST(BinaryPropertyList, readsEveryType) {
   std::iota(references.begin(), references.end(), 0);
   objects.back() = container(0xA0, references.size(), references);
   const auto bytes = binaryList(objects, [&](test::Trailer& trailer) { trailer.top = references.size(); });
-  const auto all = parsePropertyList(bytes);
+  const auto all = formats::parsePropertyList(bytes);
   ASSERT_TRUE(all.ok()) << all.error().detail;
-  EXPECT_EQ(writeJSON(all.value()),
+  EXPECT_EQ(formats::writeJSON(all.value()),
             R"([false,true,255,65534,4294967295,-2,18446744073709551615,-1,1.5,-1.5,{"$date":978307200.0},)"
             R"({"$data":"AP8="},"abc","aaaaaaaaaaaaaaa","é☃",)"
             "\"\U0001F600\",\"\uFFFDA\",\"\uFFFD\",258,[],[],{}]");
   // A null entry is left out, a repeated key counts by its last value, a set is an array.
-  const auto read = parsePropertyList(binaryList(
+  const auto read = formats::parsePropertyList(binaryList(
       {"\xD4" + bigEndian(0x0001'0002'0001'0003, 8) + bigEndian(0x0004'0005'0006'0007, 8), ascii("a"),
        ascii("n"), ascii("s"), "\x10\x01", "\0"s, "\x10\x02", "\xC2\x00\x01\x00\x06"s}));
   ASSERT_TRUE(read.ok()) << read.error().detail;
@@ -49,13 +49,13 @@ TEST(BinaryPropertyList, writesTheseBytes) {
   const std::string trailer = std::string(6, '\0') + "\x01\x01" + bigEndian(3, 8) + bigEndian(0, 8);
   EXPECT_EQ(writeBinaryPropertyList(Dictionary{{"k", "\u00e9"}}),
             "bplist00\xD1\x01\x02\x51k\x61\x00\xE9"s + "\x08\x0B\x0D" + trailer + bigEndian(16, 8));
-  const auto mended = parsePropertyList(writeBinaryPropertyList("a\xC3(\xED\xA0\x80"));
+  const auto mended = formats::parsePropertyList(writeBinaryPropertyList("a\xC3(\xED\xA0\x80"));
   ASSERT_TRUE(mended.ok());
   EXPECT_TRUE(mended.value() == Value("a\uFFFD(\uFFFD\uFFFD\uFFFD"));
 }
 
 void expectRefusal(const std::string& bytes, Kind kind) {
-  const auto read = parsePropertyList(bytes);
+  const auto read = formats::parsePropertyList(bytes);
   ASSERT_FALSE(read.ok()) << testing::PrintToString(bytes);
   EXPECT_EQ(read.error().kind, kind) << testing::PrintToString(bytes) << ": " << read.error().detail;
   EXPECT_FALSE(read.error().detail.empty()) << testing::PrintToString(bytes);
@@ -101,14 +101,14 @@ TEST(BinaryPropertyList, refusesBrokenObjects) {
 
 TEST(PropertyListLimits, holdExactlyInBothForms) {
   const Value value = Dictionary{{"abc", Array{Data{"12"}, "\u00e9"}}};
-  for (const std::string& bytes : {writeBinaryPropertyList(value), writeXMLPropertyList(value)}) {
+  for (const std::string& bytes : {writeBinaryPropertyList(value), formats::writeXMLPropertyList(value)}) {
     const PropertyListLimits fits{.bytes = bytes.size(), .depth = 2, .objects = 5, .textBytes = 7};
-    EXPECT_TRUE(parsePropertyList(bytes, fits).ok());
+    EXPECT_TRUE(formats::parsePropertyList(bytes, fits).ok());
     for (int limit = 0; limit < 4; ++limit) {
       PropertyListLimits less = fits;
       less.bytes -= limit == 0, less.objects -= limit == 1, less.textBytes -= limit == 2,
           less.depth -= limit == 3;
-      const auto read = parsePropertyList(bytes, less);
+      const auto read = formats::parsePropertyList(bytes, less);
       ASSERT_FALSE(read.ok()) << limit;
       EXPECT_EQ(read.error().kind, limit == 3 ? Kind::tooDeep : Kind::tooLarge) << limit;
     }

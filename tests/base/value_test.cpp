@@ -5,7 +5,7 @@
 
 #include <cmath>
 
-#include "base/json.h"
+#include "formats/json.h"
 
 namespace veltrad {
 namespace {
@@ -76,7 +76,7 @@ TEST(JSON, readsValues) {
       {R"({"$date": 1, "b": 2})", Dictionary{{"$date", 1}, {"b", 2}}},
       {std::string(64, '[') + std::string(64, ']'), nested}};
   for (const auto& [text, value] : kCases) {
-    const auto read = parseJSON(text);
+    const auto read = formats::parseJSON(text);
     ASSERT_TRUE(read.ok()) << text << ": " << read.error().detail;
     EXPECT_TRUE(read.value() == value) << text;
     EXPECT_EQ(read.value().type(), value.type()) << text;
@@ -90,7 +90,7 @@ TEST(JSON, saysWhatIsWrongAndWhere) {
         "1 \"\xED\xA0\x80\""s, "1 \"\xFF\""s, "0 'a'"s, "1 [NaN]"s, "0 1e999"s, "1 \"\\ud800\""s,
         "8 \"\\ude00\""s, "3 [1,]"s, "65 " + std::string(100'000, '['), R"(14 {"$date": "x"})"s,
         R"(15 {"$data": "*A"})"s}) {
-    const auto read = parseJSON(std::string_view(row).substr(row.find(' ') + 1));
+    const auto read = formats::parseJSON(std::string_view(row).substr(row.find(' ') + 1));
     ASSERT_FALSE(read.ok()) << row;
     EXPECT_NEAR(static_cast<double>(read.error().offset), std::stod(row), 1) << row;
     EXPECT_FALSE(read.error().detail.empty()) << row;
@@ -98,9 +98,9 @@ TEST(JSON, saysWhatIsWrongAndWhere) {
 }
 
 TEST(JSON, isWrittenInOrderAndMended) {
-  EXPECT_EQ(writeJSON(Dictionary{{"b", Array{1, 2.0}}, {"a", "x"}}), R"({"a":"x","b":[1,2.0]})");
-  EXPECT_EQ(writeJSON(Dictionary{{"a", 1}}, JSONStyle::pretty), "{\n  \"a\": 1\n}");
-  EXPECT_EQ(writeJSON(Array{NAN, HUGE_VAL, "a\xFF"}), "[null,null,\"a\uFFFD\"]");
+  EXPECT_EQ(formats::writeJSON(Dictionary{{"b", Array{1, 2.0}}, {"a", "x"}}), R"({"a":"x","b":[1,2.0]})");
+  EXPECT_EQ(formats::writeJSON(Dictionary{{"a", 1}}, formats::JSONStyle::pretty), "{\n  \"a\": 1\n}");
+  EXPECT_EQ(formats::writeJSON(Array{NAN, HUGE_VAL, "a\xFF"}), "[null,null,\"a\uFFFD\"]");
 }
 
 }  // namespace

@@ -23,7 +23,7 @@ class FakeDaemon {
 
   // Says `greeting` in answer to a hello.
   explicit FakeDaemon(Handler handler,
-                      std::string greeting = ipc::makeFrame(FrameKind::hello, 0, {{"wire", 1}}))
+                      std::string greeting = wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", 1}}))
       : _handler(std::move(handler)),
         _greeting(std::move(greeting)),
         _listener(unixSocket(::bind, root.socketPath())) {
@@ -41,14 +41,14 @@ class FakeDaemon {
  private:
   void accept() {
     for (;;) {
-      platform::FileDescriptor socket(::accept4(_listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
+      FileDescriptor socket(::accept4(_listener.get(), nullptr, nullptr, SOCK_CLOEXEC));
       if (!socket.isOpen()) return;
       WireEnd& link = _links.emplace_back(std::move(socket));
       _threads.emplace_back([this, &link] { serve(link); });
     }
   }
   void serve(WireEnd& link) {
-    EXPECT_EQ(link.next().body.uint32("wire"), ipc::kWireVersion);
+    EXPECT_EQ(link.next().body.uint32("wire"), wire::kWireVersion);
     link.send(_greeting);
     while (const auto call = link.receive()) _handler(link, *call);
     link.hangUp();
@@ -56,14 +56,14 @@ class FakeDaemon {
 
   const Handler _handler;
   const std::string _greeting;
-  const platform::FileDescriptor _listener;
+  const FileDescriptor _listener;
   std::thread _accepting;
   std::list<WireEnd> _links;  // the accepting thread's until it has ended
   std::vector<std::thread> _threads;
 };
 
 inline std::string replyFrame(std::uint32_t callID, Dictionary results) {
-  return ipc::makeFrame(FrameKind::reply, callID, {{"results", std::move(results)}});
+  return wire::makeFrame(wire::FrameKind::reply, callID, {{"results", std::move(results)}});
 }
 
 // Answers a message with "CATEGORY/TYPE", another call with its name, each with two backends besides.

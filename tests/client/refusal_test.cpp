@@ -7,7 +7,7 @@ namespace {
 
 TEST(Refusal, OfADaemonThatSaysNothingComesInTime) {
   FakeDaemon daemon([](auto&...) {}, "");
-  const auto reached = reachDaemon(daemon.root.socketPath(), "", std::chrono::milliseconds(50));
+  const auto reached = client::reachDaemon(daemon.root.socketPath(), "", std::chrono::milliseconds(50));
   ASSERT_FALSE(reached);
   EXPECT_EQ(reached.error().status, VELTRA_NO_DAEMON);
   EXPECT_EQ(reached.error().text, "The daemon on " + daemon.root.socketPath() +

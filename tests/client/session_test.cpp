@@ -7,13 +7,13 @@ namespace {
 constexpr const char* kAggregated = "sendMessageToClient:timestamp:category:type:payload:";
 
 std::string eventFrame(const char* op, Dictionary args) {
-  return ipc::makeFrame(FrameKind::event, 0, {{"op", op}, {"args", std::move(args)}});
+  return wire::makeFrame(wire::FrameKind::event, 0, {{"op", op}, {"args", std::move(args)}});
 }
 
 TEST(Session, CarriesAWholeConversation) {
   Journal calls;
   FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-    calls.add(call.op() + (call.callID == 0 ? " without reply " : " ") + writeJSON(call.args()));
+    calls.add(call.op() + (call.callID == 0 ? " without reply " : " ") + formats::writeJSON(call.args()));
     if (call.op() != "flushMessagesWithCompletion:") return answerPlainly(link, call);
     // In one write with the answer, so that the waiting thread finds them.
     const Dictionary args{{"sessionInfo", Dictionary{{"sessionID", 8}}},

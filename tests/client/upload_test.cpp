@@ -17,16 +17,16 @@ std::string fileIn(const std::string& directory, const char* name) {
 TEST(Upload, DescriptorsThatWaitTravelWithTheirFrames) {
   TemporaryDirectory directory;
   const auto file = [&](const char* name) {
-    return std::make_shared<UploadedFile>(fileIn(directory.path(), name));
+    return std::make_shared<client::UploadedFile>(fileIn(directory.path(), name));
   };
   int ends[2];
   ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
-  const platform::FileDescriptor out(ends[0]), in(ends[1]);
-  OutFrames frames;
+  const FileDescriptor out(ends[0]), in(ends[1]);
+  client::OutFrames frames;
   std::uint32_t queued = 0;
-  const auto put = [&](const std::shared_ptr<UploadedFile>& lent) {
+  const auto put = [&](const std::shared_ptr<client::UploadedFile>& lent) {
     const Dictionary body{{"bulk", Data{std::string(30'000, 'b')}}};
-    frames.write(out.get(), ipc::makeFrame(FrameKind::call, ++queued, body, lent ? 1 : 0), lent);
+    frames.write(out.get(), wire::makeFrame(wire::FrameKind::call, ++queued, body, lent ? 1 : 0), lent);
   };
   put(file("1"));  // goes at once
   while (frames.empty()) put(nullptr);
@@ -38,11 +38,11 @@ TEST(Upload, DescriptorsThatWaitTravelWithTheirFrames) {
 
   ipc::SocketReader reader(nullptr);
   std::string lent;
-  ipc::Frame frame;
+  wire::Frame frame;
   for (std::uint32_t read = 0; read < queued;) {
     frames.writeWaiting(out.get());
     ASSERT_EQ(reader.receive(in.get()), ipc::SocketReader::Got::bytes);
-    while (reader.next(frame) == ipc::FrameReader::Next::frame) {
+    while (reader.next(frame) == wire::FrameReader::Next::frame) {
       EXPECT_EQ(frame.header.callID, ++read);
       if (frame.header.descriptors == 0) continue;
       const auto descriptor = reader.takeDescriptor();
@@ -60,8 +60,8 @@ TEST(Upload, RemovesForThoseWhoAskForNoAnswerAndOnlyWhatTheCallLent) {
     if (call.callID == 0) return;
     const std::string path = *call.args().string("path");
     const std::uint32_t named = path.ends_with("kept") ? call.callID + 1 : call.callID;
-    link.send(ipc::makeFrame(FrameKind::event, 0,
-                             {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", named}}}}));
+    link.send(wire::makeFrame(wire::FrameKind::event, 0,
+                              {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", named}}}}));
     link.send(replyFrame(call.callID, {{"uploaded", true}}));
   });
   veltra::Session session = open(daemon);

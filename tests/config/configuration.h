@@ -6,16 +6,16 @@
 #include <vector>
 
 #include "base/base64.h"
-#include "base/property_list.h"
 #include "config/process_settings.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
+#include "formats/property_list.h"
 #include "platform/root.h"
-#include "protocol/veltra.h"
 #include "rsa_key.h"
 #include "support/device_identity.h"
+#include "support/veltra.h"
 
 namespace veltrad {
 
@@ -30,7 +30,7 @@ struct ExpectedLog : RecordedLog {
 
 // A container around the bag bytes, signed with the shared key.
 inline std::string container(const std::string& bag) {
-  return writeXMLPropertyList(
+  return formats::writeXMLPropertyList(
       Dictionary{{"signature", encodeBase64(RSAKey::shared().sign(bag))}, {"bag", encodeBase64(bag)}});
 }
 
@@ -40,20 +40,20 @@ struct Configuration {
     preferences.set("veltra_storebag_url", "https://bags.test/x");
     files.put(root.publicKeyPath(), RSAKey::shared().encoded());
   }
-  void answers(std::string body, platform::HTTPHeaders headers) {
-    answer = platform::HTTPResponse{200, std::move(headers), std::move(body)};
+  void answers(std::string body, http::HTTPHeaders headers) {
+    answer = http::HTTPResponse{200, std::move(headers), std::move(body)};
   }
 
   platform::Root root{"/"};
   FakeDeviceProperties properties;
-  DeviceIdentity device{properties};
+  support::DeviceIdentity device{properties};
   MemoryPreferences preferences;
   FakeFileStore files;
-  ProcessSettings settings{preferences, device, files, root.deploymentPath()};
-  Veltra veltra{files, preferences, root};
-  platform::HTTPResult answer =
-      Failure{platform::HTTPError{platform::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
-  FakeHTTPClient client{[this](platform::HTTPRequest) { return answer; }};
+  config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
+  support::Veltra veltra{files, preferences, root};
+  http::HTTPResult answer =
+      Failure{http::HTTPError{http::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
+  FakeHTTPClient client{[this](http::HTTPRequest) { return answer; }};
 };
 
 }  // namespace veltrad

@@ -6,6 +6,7 @@
 #include <functional>
 
 #include "configuration.h"
+#include "formats/property_list.h"
 
 namespace veltrad {
 namespace {
@@ -21,7 +22,7 @@ struct Machine : Configuration {
 TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
   const std::string path = platform::Root("/").deploymentPath();
   const auto hosts = [](const char* outside) {
-    return writeXMLPropertyList(
+    return formats::writeXMLPropertyList(
         Dictionary{{"internalStorebagHost", "in.test:8443"}, {"publicStorebagHost", outside}});
   };
   const std::string publicURL = "https://storebags.example/bags/maple", unreadable = "(unreadable)";
@@ -30,19 +31,22 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
     std::string deployment;
     bool internal;
     std::string url, warning;
-  } table[] = {
-      {{}, "", true, "https://storebags.internal.example/storebags/maple", ""},
-      {{}, "", false, publicURL, ""},
-      {{}, hosts("out.test"), true, "https://in.test:8443/storebags/maple", ""},
-      {Array{}, hosts("out.test"), false, "https://out.test/bags/maple", ""},
-      {"https://lab.test/x", unreadable, true, "https://lab.test/x", ""},
-      {{}, unreadable, false, publicURL, ": Permission denied; using the built-in hosts"},
-      {{}, writeXMLPropertyList(Array{}), false, publicURL, ": not a dictionary; using the built-in hosts"},
-      {{},
-       hosts("a/b"),
-       false,
-       publicURL,
-       ": publicStorebagHost is \"a/b\", expected a host name; using storebags.example"}};
+  } table[] = {{{}, "", true, "https://storebags.internal.example/storebags/maple", ""},
+               {{}, "", false, publicURL, ""},
+               {{}, hosts("out.test"), true, "https://in.test:8443/storebags/maple", ""},
+               {Array{}, hosts("out.test"), false, "https://out.test/bags/maple", ""},
+               {"https://lab.test/x", unreadable, true, "https://lab.test/x", ""},
+               {{}, unreadable, false, publicURL, ": Permission denied; using the built-in hosts"},
+               {{},
+                formats::writeXMLPropertyList(Array{}),
+                false,
+                publicURL,
+                ": not a dictionary; using the built-in hosts"},
+               {{},
+                hosts("a/b"),
+                false,
+                publicURL,
+                ": publicStorebagHost is \"a/b\", expected a host name; using storebags.example"}};
   for (const auto& c : table) {
     const ExpectedLog log(c.warning.empty() ? Lines() : Lines{"4 storebagServerURL: " + path + c.warning});
     Machine machine(c.internal, c.preference);
@@ -58,13 +62,13 @@ TEST(ProcessSettings, AreNothingDuringAShortageAndRightAfterIt) {
   const std::string path = platform::Root("/").deploymentPath();
   const ExpectedLog log({});
   Machine machine(true, {});
-  machine.files.put(path, writeXMLPropertyList(Dictionary{{"internalStorebagHost", "in.test"}}));
+  machine.files.put(path, formats::writeXMLPropertyList(Dictionary{{"internalStorebagHost", "in.test"}}));
   const std::function<void(bool)> shortages[] = {[&](bool on) { machine.preferences.runShort(on); },
                                                  [&](bool on) { machine.properties.runShort(on); },
                                                  [&](bool on) { machine.files.runShort(on); }};
   for (const auto& runShort : shortages) {
-    DeviceIdentity device(machine.properties);
-    ProcessSettings fresh(machine.preferences, device, machine.files, path);
+    support::DeviceIdentity device(machine.properties);
+    config::ProcessSettings fresh(machine.preferences, device, machine.files, path);
     runShort(true);
     EXPECT_EQ(fresh.storebagServerURL(), std::nullopt);
     const auto environment = fresh.currentEnvironment();

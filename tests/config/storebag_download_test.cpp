@@ -9,6 +9,7 @@
 #include "config/storebag_container.h"
 #include "config/storebag_section.h"
 #include "configuration.h"
+#include "formats/property_list.h"
 
 namespace veltrad {
 namespace {
@@ -24,7 +25,7 @@ const std::string kNotVerified = "3 " + kAt + "Signature can not be verified, 0x
 struct Fetch {
   Fetch(Configuration& configuration, const Lines& lines) {
     const ExpectedLog log(lines);
-    StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
+    config::StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
     storebag = download.fetchStorebagWithName("ostvane", maxAge, notModified, &lastModified, attempted);
   }
   std::optional<Dictionary> storebag;
@@ -46,8 +47,8 @@ TEST(CacheControl, GivesTheMaxAgeOrADay) {
       {INT_MIN, {"max-age=-99999999999999999999999"}},
   };
   for (const auto& [seconds, texts] : table)
-    for (const std::string_view text : texts) EXPECT_EQ(maxAgeOfCacheControl(text), seconds) << text;
-  EXPECT_EQ(maxAgeOfCacheControl(std::nullopt), 86'400);
+    for (const std::string_view text : texts) EXPECT_EQ(config::maxAgeOfCacheControl(text), seconds) << text;
+  EXPECT_EQ(config::maxAgeOfCacheControl(std::nullopt), 86'400);
 }
 
 // What is read before the exchange and after it, and the exchange itself.
@@ -61,9 +62,9 @@ TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
   configuration.preferences.runShort(true);
   isNone("preferences");
   configuration.preferences.runShort(false);
-  configuration.answer = Failure{platform::HTTPError{platform::HTTPError::Kind::shortage, "why"}};
+  configuration.answer = Failure{http::HTTPError{http::HTTPError::Kind::shortage, "why"}};
   isNone("exchange");
-  configuration.answers(container(writeXMLPropertyList(kStorebag)), {});
+  configuration.answers(container(formats::writeXMLPropertyList(kStorebag)), {});
   for (const std::string& path :
        {configuration.root.packageManifestPath(), configuration.root.publicKeyPath()}) {
     configuration.files.failReads(path, FakeFileStore::Kind::shortage);
@@ -76,15 +77,16 @@ TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
 }
 
 TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
-  const std::string bag = writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
+  const std::string bag = formats::writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
   const std::string signature = encodeBase64(RSAKey::shared().sign(bag));
   const auto list = [](Value sign, Value content) {
-    return writeXMLPropertyList(Dictionary{{"signature", std::move(sign)}, {"bag", std::move(content)}});
+    return formats::writeXMLPropertyList(
+        Dictionary{{"signature", std::move(sign)}, {"bag", std::move(content)}});
   };
   const std::pair<std::string, Lines> table[] = {
       {"", {kNoList, kMissing}},  // current only to one who holds a copy
       {"<html>Not Found</html>", {kNoList, kMissing}},
-      {writeXMLPropertyList(Array{}), {kMissing}},
+      {formats::writeXMLPropertyList(Array{}), {kMissing}},
       {list(7, bagText), {kMissing}},
       {list("a", bagText), {}},
       {list(signature, 7), {}},
@@ -92,7 +94,7 @@ TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
       {list("", bagText), {kNotVerified}},
       {list(signature, encodeBase64(bag + " ")), {kNotVerified}},
       {container("signed, but no list"), {}},
-      {container(writeXMLPropertyList(Array{})), {}}};
+      {container(formats::writeXMLPropertyList(Array{})), {}}};
   for (const auto& [body, lines] : table) {
     Configuration configuration;
     configuration.answers(body, {{"Last-Modified", kTuesday}, {"Cache-Control", "max-age=600"}});
@@ -110,12 +112,12 @@ TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
   Value deep(1);
   for (int i = 0; i < 9; ++i) deep = Array{deep};
   for (const Value& list :
-       {deep, Value(Array(1'001, Value(1))), Value(std::string(kStorebagMostContainerBytes, 'x'))})
-    EXPECT_FALSE(parseStorebagContainer(writeXMLPropertyList(list)));
+       {deep, Value(Array(1'001, Value(1))), Value(std::string(config::kStorebagMostContainerBytes, 'x'))})
+    EXPECT_FALSE(config::parseStorebagContainer(formats::writeXMLPropertyList(list)));
   Dictionary bag;
-  for (int depth = 1; depth < kStorebagBagLimits.depth; ++depth) bag = Dictionary{{"deeper", bag}};
-  EXPECT_EQ(parseStorebagBag(writeBinaryPropertyList(bag)), bag);
-  EXPECT_FALSE(parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
+  for (int depth = 1; depth < config::kStorebagBagLimits.depth; ++depth) bag = Dictionary{{"deeper", bag}};
+  EXPECT_EQ(config::parseStorebagBag(writeBinaryPropertyList(bag)), bag);
+  EXPECT_FALSE(config::parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
 }
 
 struct Choice {
@@ -123,8 +125,9 @@ struct Choice {
          const char* cacheControl = "max-age=600") {
     const ExpectedLog log(lines);
     Configuration configuration(environment);
-    configuration.answers(container(writeXMLPropertyList(storebag)), {{"Cache-Control", cacheControl}});
-    StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
+    configuration.answers(container(formats::writeXMLPropertyList(storebag)),
+                          {{"Cache-Control", cacheControl}});
+    config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
     section = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified, nullptr,
                                                                 attempted);
   }

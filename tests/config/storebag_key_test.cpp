@@ -51,7 +51,7 @@ TEST(StorebagKey, VerifiesOneSignatureOfItsOwnAndNothingClose) {
   };
   const RSAKey other(EVP_RSA_gen(2'048u));
   const RSAKey& signer = RSAKey::shared();
-  const auto key = StorebagKey::fromDER(signer.encoded());
+  const auto key = config::StorebagKey::fromDER(signer.encoded());
   ASSERT_TRUE(key);
   const std::string good = signer.sign(kBag);
   Table signatures = {
@@ -98,15 +98,15 @@ std::string infoOf(char algorithm, const std::string& parameters) {
 
 TEST(StorebagKey, TakesPublicKeysInBoundsAlone) {
   for (const int bits : {2'048, 3'072, 8'192}) {
-    const auto key = StorebagKey::fromDER(keyOf(bits));
+    const auto key = config::StorebagKey::fromDER(keyOf(bits));
     ASSERT_TRUE(key) << bits;
     EXPECT_EQ(key->modulusBits(), bits);
   }
-  EXPECT_TRUE(StorebagKey::fromDER(infoOf(1, der(5, ""))));
+  EXPECT_TRUE(config::StorebagKey::fromDER(infoOf(1, der(5, ""))));
   const RSAKey& good = RSAKey::shared();
   const std::string info = good.encoded();
   for (const std::string& form : {info, good.encoded("type-specific")})
-    EXPECT_TRUE(verifySignature(form, kBag, good.sign(kBag)));
+    EXPECT_TRUE(config::verifySignature(form, kBag, good.sign(kBag)));
   for (const std::string& bytes :
        {std::string(), keyOf(2'047), keyOf(8'193), keyOf(2'048, "\1"), keyOf(2'048, "\4"),
         good.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM"),
@@ -114,8 +114,8 @@ TEST(StorebagKey, TakesPublicKeysInBoundsAlone) {
         info.substr(0, info.size() - 1), info + "\0"s,
         RSAKey(EVP_EC_gen("P-256")).encoded(),  // no RSA
         infoOf(10, "")}) {
-    EXPECT_FALSE(StorebagKey::fromDER(bytes)) << bytes.size();
-    EXPECT_FALSE(verifySignature(bytes, kBag, good.sign(kBag)));
+    EXPECT_FALSE(config::StorebagKey::fromDER(bytes)) << bytes.size();
+    EXPECT_FALSE(config::verifySignature(bytes, kBag, good.sign(kBag)));
   }
 }
 

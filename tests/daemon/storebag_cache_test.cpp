@@ -15,7 +15,7 @@ namespace veltrad {
 namespace {
 
 // Answers as the test says; may be told to hold an exchange until it is let go.
-struct Source final : StorebagSource {
+struct Source final : config::StorebagSource {
   std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(std::int32_t, std::int32_t& maxAge,
                                                                      std::optional<std::string>& version,
                                                                      bool& notModified,
@@ -69,7 +69,7 @@ class Cache : public ::testing::Test {
   RecordedLog log;
   FakeClock clock;
   Source source;
-  StorebagCache cache{source, clock};
+  daemon::StorebagCache cache{source, clock};
 
  private:
   RecursiveMutex _lock AGENT_LOCK{LockRank::agent};

@@ -6,22 +6,20 @@
 #include <functional>
 #include <utility>
 
-#include "platform/http_client.h"
+#include "http/http_client.h"
 
 namespace veltrad {
 
-class FakeHTTPClient final : public platform::HTTPClient {
+class FakeHTTPClient final : public http::HTTPClient {
  public:
-  using Answerer = std::function<platform::HTTPResult(platform::HTTPRequest)>;
+  using Answerer = std::function<http::HTTPResult(http::HTTPRequest)>;
   explicit FakeHTTPClient(Answerer answerer = nullptr) : _answerer(std::move(answerer)) {}
 
-  std::optional<platform::HTTPError> start(platform::HTTPRequest request, platform::HTTPCompletion) override {
+  std::optional<http::HTTPError> start(http::HTTPRequest request, http::HTTPCompletion) override {
     ADD_FAILURE() << "a post to " << request.url;
     return std::nullopt;
   }
-  platform::HTTPResult perform(platform::HTTPRequest request) override {
-    return _answerer(std::move(request));
-  }
+  http::HTTPResult perform(http::HTTPRequest request) override { return _answerer(std::move(request)); }
 
  private:
   const Answerer _answerer;

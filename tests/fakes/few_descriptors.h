@@ -4,7 +4,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
 namespace veltrad {
 
@@ -13,7 +13,7 @@ class FewDescriptors {
  public:
   explicit FewDescriptors(unsigned free = 0) {
     ::getrlimit(RLIMIT_NOFILE, &_before);
-    platform::FileDescriptor next[4];
+    FileDescriptor next[4];
     for (auto& one : next) one.reset(::dup(STDIN_FILENO));
     const rlimit few{static_cast<rlim_t>(next[free].get()), _before.rlim_max};
     ::setrlimit(RLIMIT_NOFILE, &few);

@@ -4,18 +4,18 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
+#include "base/file_descriptor.h"
 #include "fakes/temporary_directory.h"
-#include "platform/file_descriptor.h"
 
 namespace veltrad {
 
 // A Unix socket bound to `path` or connected to it.
 template <typename Attach>
-platform::FileDescriptor unixSocket(Attach attach, const std::string& path, int type = SOCK_STREAM) {
+FileDescriptor unixSocket(Attach attach, const std::string& path, int type = SOCK_STREAM) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   path.copy(address.sun_path, sizeof address.sun_path - 1);
-  platform::FileDescriptor made(::socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
+  FileDescriptor made(::socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
   EXPECT_EQ(attach(made.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0) << path;
   return made;
 }

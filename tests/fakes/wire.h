@@ -15,15 +15,15 @@
 #include <thread>
 #include <vector>
 
-#include "base/json.h"
 #include "base/property_list.h"
 #include "fakes/unix_socket.h"
-#include "ipc/frame.h"
+#include "formats/json.h"
 #include "platform/root.h"
+#include "wire/frame.h"
 
 namespace veltrad {
 
-using ipc::FrameKind;
+using wire::FrameKind;
 inline constexpr std::chrono::seconds kPatience{20};
 inline constexpr const char* kSend = "sendMessageWithCategory:type:payload:reply:";
 
@@ -71,20 +71,23 @@ class Gate {
 class TemporaryRoot : private TemporaryDirectory, public platform::Root {
  public:
   using platform::Root::path;
-  TemporaryRoot() : Root(TemporaryDirectory::path()) { std::filesystem::create_directories(runDirectory()); }
+  TemporaryRoot() : platform::Root(TemporaryDirectory::path()) {
+    std::filesystem::create_directories(runDirectory());
+  }
 };
 
 // A header with any body behind it, and any length in it.
-inline std::string rawFrame(FrameKind kind, std::string_view body, std::optional<std::size_t> length = {},
-                            std::uint8_t descriptors = 0, std::uint32_t callID = 9) {
-  std::string bytes(ipc::kFrameHeaderBytes, '\0');
+inline std::string rawFrame(wire::FrameKind kind, std::string_view body,
+                            std::optional<std::size_t> length = {}, std::uint8_t descriptors = 0,
+                            std::uint32_t callID = 9) {
+  std::string bytes(wire::kFrameHeaderBytes, '\0');
   const auto declared = static_cast<std::uint32_t>(length.value_or(body.size()));
-  ipc::encodeFrameHeader({declared, kind, descriptors, callID}, bytes.data());
+  wire::encodeFrameHeader({declared, kind, descriptors, callID}, bytes.data());
   return bytes.append(body);
 }
 
 struct Received {
-  FrameKind kind{};
+  wire::FrameKind kind{};
   std::uint32_t callID = 0;
   Dictionary body;
 
@@ -97,14 +100,14 @@ struct Received {
   // As JSON, or what the error says.
   std::string results() const {
     const Value* found = body.find("results");
-    return found ? writeJSON(*found) : description();
+    return found ? formats::writeJSON(*found) : description();
   }
 };
 
 // Frames from a bare socket and bytes to it. One thread, but for hangUp().
 class WireEnd {
  public:
-  explicit WireEnd(platform::FileDescriptor socket) : _socket(std::move(socket)) {
+  explicit WireEnd(FileDescriptor socket) : _socket(std::move(socket)) {
     const timeval patience{kPatience.count(), 0};
     ::setsockopt(_socket.get(), SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience);
     ::setsockopt(_socket.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
@@ -133,8 +136,8 @@ class WireEnd {
   }
   // Nothing: the end, or no readable frame in time.
   std::optional<Received> receive() {
-    ipc::Frame frame;
-    while (_reader.next(frame) == ipc::FrameReader::Next::needMore) {
+    wire::Frame frame;
+    while (_reader.next(frame) == wire::FrameReader::Next::needMore) {
       const auto [place, size] = _reader.room();
       const ssize_t count = ::recv(_socket.get(), place, size, 0);
       _ended = count == 0 || (count < 0 && errno == ECONNRESET);
@@ -166,8 +169,8 @@ class WireEnd {
   void close() { _socket.reset(); }
 
  private:
-  platform::FileDescriptor _socket;
-  ipc::FrameReader _reader;
+  FileDescriptor _socket;
+  wire::FrameReader _reader;
   bool _ended = false;
 };
 

@@ -2,19 +2,19 @@
 // above.
 #pragma once
 
+#include "backends/ampery/energy_log.h"
 #include "backends/backend_factory.h"
+#include "backends/dashboard/work_pool.h"
+#include "backends/mivo/code_bundle.h"
 #include "config/process_settings.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/machine.h"
-#include "platform/code_bundle.h"
 #include "platform/counters.h"
-#include "platform/energy_log.h"
 #include "platform/lent_files.h"
 #include "platform/root.h"
-#include "platform/work_pool.h"
-#include "protocol/veltra.h"
 #include "support/device_identity.h"
+#include "support/veltra.h"
 
 namespace veltrad {
 
@@ -27,17 +27,18 @@ struct World {
   FakeDeviceProperties properties;
   FakeFileStore files;
   platform::Counters counters;
-  platform::EnergyLog energyLog{clock, counters, "/nowhere/energy.jsonl"};
-  platform::CodeBundle adaptorBundle{"/nowhere", "none"};
-  platform::WorkPool pool;
+  backends::EnergyLog energyLog{clock, counters, "/nowhere/energy.jsonl"};
+  backends::CodeBundle adaptorBundle{"/nowhere", "none"};
+  backends::WorkPool pool;
   platform::LentFiles lentFiles;
   platform::Root root{"/"};
-  DeviceIdentity device{properties};
-  ProcessSettings settings{preferences, device, files, root.deploymentPath()};
-  Veltra library{files, preferences, root};
-  const BackendServices services{http,          clock,    random, locale,  preferences, counters, energyLog,
-                                 adaptorBundle, settings, device, library, pool,        lentFiles};
-  StandardBackendFactory factory{services};
+  support::DeviceIdentity device{properties};
+  config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
+  support::Veltra library{files, preferences, root};
+  const backends::BackendServices services{http,     clock,     random,        locale,   preferences,
+                                           counters, energyLog, adaptorBundle, settings, device,
+                                           library,  pool,      lentFiles};
+  backends::StandardBackendFactory factory{services};
 };
 
 }  // namespace veltrad

@@ -10,42 +10,47 @@
 #include <vector>
 
 #include "ipc/dispatcher.h"
-#include "ipc/frame.h"
+#include "wire/frame.h"
 
 namespace {
 
 using namespace veltrad;
 
 // Counts the calls, and answers them in its own ways or not at all.
-class AnsweringSession final : public ClientSessionInterface {
+class AnsweringSession final : public wire::ClientSessionInterface {
  public:
   std::size_t calls = 0;
 
-  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+  bool setSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::optional<Array>,
+                      bool) override {
     ++calls;
     return true;
   }
-  void startConfigWithCompletionHandler(NamesReply reply) override {
+  void startConfigWithCompletionHandler(wire::NamesReply reply) override {
     answer(reply, std::vector<std::string>{"x"});
   }
-  void fetchStatesWithUserInfo(OptionalDictionary, NamesReply reply) override { answer(reply, std::nullopt); }
-  void fetchDisplayURL(StringReply reply) override { answer(reply, "URL not available"); }
-  void sendMessageWithCategory(std::uint16_t, std::uint16_t, OptionalDictionary d,
-                               StringReply reply) override {
+  void fetchStatesWithUserInfo(wire::OptionalDictionary, wire::NamesReply reply) override {
+    answer(reply, std::nullopt);
+  }
+  void fetchDisplayURL(wire::StringReply reply) override { answer(reply, "URL not available"); }
+  void sendMessageWithCategory(std::uint16_t, std::uint16_t, wire::OptionalDictionary d,
+                               wire::StringReply reply) override {
     answer(reply, d && d->string("text") ? std::optional(*d->string("text")) : std::nullopt);
   }
-  void sendMessageWithDictionary(Dictionary, StringReply) override { ++calls; }
-  void flushMessagesWithCompletion(FlushReply reply) override { answer(reply, "flushed", std::nullopt); }
-  void finishSessionWithReply(StringReply reply) override { answer(reply, std::nullopt); }
-  void uploadFileAtPath(std::string, std::string token, BooleanReply reply) override {
+  void sendMessageWithDictionary(Dictionary, wire::StringReply) override { ++calls; }
+  void flushMessagesWithCompletion(wire::FlushReply reply) override {
+    answer(reply, "flushed", std::nullopt);
+  }
+  void finishSessionWithReply(wire::StringReply reply) override { answer(reply, std::nullopt); }
+  void uploadFileAtPath(std::string, std::string token, wire::BooleanReply reply) override {
     if (!token.empty()) std::abort();
     answer(reply, true);
   }
-  void uploadLogData(Array data, UploadLogDataReply reply) override {
-    answer(reply, data.empty(), makeReportingError("refused", 403));
+  void uploadLogData(Array data, wire::UploadLogDataReply reply) override {
+    answer(reply, data.empty(), wire::makeReportingError("refused", 403));
   }
-  void sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t, std::uint16_t,
-                                  OptionalDictionary, StringReply reply) override {
+  void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
+                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply reply) override {
     answer(reply, "finished");
   }
   void end() override {}
@@ -64,20 +69,20 @@ using Seen = std::tuple<std::vector<std::string>, bool, std::size_t>;
 
 Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
   static platform::Counters counters;
-  static const auto out = std::make_shared<ipc::OutQueue>(platform::FileDescriptor(), counters, nullptr);
+  static const auto out = std::make_shared<ipc::OutQueue>(FileDescriptor(), counters, nullptr);
   static const auto account = platform::MemoryBudget().accountOf(0);
   AnsweringSession session;
-  ipc::FrameReader reader;
+  wire::FrameReader reader;
   std::vector<std::string> bodies;
   std::size_t readable = 0;
-  auto next = ipc::FrameReader::Next();
-  while (size > 0 && next != ipc::FrameReader::Next::impossible) {
+  auto next = wire::FrameReader::Next();
+  while (size > 0 && next != wire::FrameReader::Next::impossible) {
     const std::size_t count = std::min(size, piece);
     std::memcpy(reader.room(count).first, bytes, count);
     reader.received(count);
     bytes += count;
     size -= count;
-    for (ipc::Frame frame; (next = reader.next(frame)) == ipc::FrameReader::Next::frame;) {
+    for (wire::Frame frame; (next = reader.next(frame)) == wire::FrameReader::Next::frame;) {
       bodies.emplace_back(frame.body);
       ipc::CallMemory memory{account,
                              *account->tryCharge(3 * frame.body.size(), platform::MemoryUse::working),
@@ -86,7 +91,7 @@ Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
     }
   }
   if (session.calls != readable) std::abort();  // a call is run exactly when it is readable
-  return {std::move(bodies), next == ipc::FrameReader::Next::impossible, readable};
+  return {std::move(bodies), next == wire::FrameReader::Next::impossible, readable};
 }
 
 }  // namespace

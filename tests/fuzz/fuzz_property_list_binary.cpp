@@ -1,5 +1,5 @@
 // Binary property lists from anyone: what is read is written and read again as the same value.
-#include "base/property_list.h"
+#include "formats/property_list.h"
 #include "same_value.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
@@ -11,6 +11,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   // XML has no word for all of it, but for every value a text that is read.
   PropertyListLimits wide;
   wide.textBytes *= 3;
-  if (!parseXMLPropertyList(writeXMLPropertyList(read.value()), wide).ok()) std::abort();
+  if (!formats::parseXMLPropertyList(formats::writeXMLPropertyList(read.value()), wide).ok()) std::abort();
   return 0;
 }

@@ -4,7 +4,7 @@
 #include <cstdlib>
 #include <string_view>
 
-#include "base/json.h"
+#include "formats/json.h"
 #include "tools/ctl/answers.h"
 #include "tools/ctl/session_lines.h"
 
@@ -15,7 +15,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   if (!line) {
     // The answer must itself be one line of JSON.
     const std::string answer = ctl::formatMalformedLine(1, line.error());
-    if (answer.find('\n') != std::string::npos || !parseJSON(answer).ok()) std::abort();
+    if (answer.find('\n') != std::string::npos || !formats::parseJSON(answer).ok()) std::abort();
   } else if (ctl::isBlankLine(text) || line.value().duration > ctl::kLongestSleep) {
     std::abort();
   }

@@ -35,16 +35,17 @@ constexpr const char* kSignedBag =
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace veltrad;
-  static const StorebagKey key = StorebagKey::fromDER(decodeBase64(kPublicKey).value()).value();
+  static const config::StorebagKey key =
+      config::StorebagKey::fromDER(decodeBase64(kPublicKey).value()).value();
   static const std::string signedBag = decodeBase64(kSignedBag).value();
   const std::string_view bytes(reinterpret_cast<const char*>(data), size);
 
-  if (const auto container = parseStorebagContainer(bytes)) {
-    const auto decoded = decodeStorebagContainer(container.value());
+  if (const auto container = config::parseStorebagContainer(bytes)) {
+    const auto decoded = config::decodeStorebagContainer(container.value());
     if (decoded && key.verifies(decoded->bag, decoded->signature) && decoded->bag != signedBag) std::abort();
   }
   // What only a signed bag reaches, and what only a header does.
-  parseStorebagBag(bytes);
-  maxAgeOfCacheControl(bytes);
+  config::parseStorebagBag(bytes);
+  config::maxAgeOfCacheControl(bytes);
   return 0;
 }

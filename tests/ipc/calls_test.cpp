@@ -9,27 +9,27 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
     return callFrame(9, op, std::move(arguments));
   };
   const std::vector<std::pair<std::string, const char*>> cases{
-      {rawFrame(FrameKind::call, ""), "the body is no readable property list"},
-      {rawFrame(FrameKind::call, "bplist00 and then rubbish"), "the body is no readable property list"},
-      {rawFrame(FrameKind::call, writeBinaryPropertyList(Array{1})), "the body must be a dictionary"},
-      {ipc::makeFrame(FrameKind::call, 9, {{"args", Dictionary{}}}), "\"op\" must be a text"},
+      {rawFrame(wire::FrameKind::call, ""), "the body is no readable property list"},
+      {rawFrame(wire::FrameKind::call, "bplist00 and then rubbish"), "the body is no readable property list"},
+      {rawFrame(wire::FrameKind::call, writeBinaryPropertyList(Array{1})), "the body must be a dictionary"},
+      {wire::makeFrame(wire::FrameKind::call, 9, {{"args", Dictionary{}}}), "\"op\" must be a text"},
       {call("launch:", {}), "unknown operation \"launch:\""},
       {call(kSend, {{"category", "5"}, {"type", 1}}), "argument \"category\" must be a number"},
       {call(kSend, {{"category", 5}}), "argument \"type\" must be a number"},
       {call("sendMessageWithDictionary:reply:", {{"message", 1}}),
        "argument \"message\" must be a dictionary"},
       {call(kOneShot, {{"type", 1}}), "argument \"category\" must be a number"},
-      {callFrame(9, kSend, {}, FrameKind::largeCall),
+      {callFrame(9, kSend, {}, wire::FrameKind::largeCall),
        "a large call is for \"uploadLogData:completionHandler:\" alone"},
-      {rawFrame(FrameKind::reply, writeBinaryPropertyList(Dictionary{})), "not of kind 3"},
-      {rawFrame(static_cast<FrameKind>(200), ""), "not of kind 200"},
+      {rawFrame(wire::FrameKind::reply, writeBinaryPropertyList(Dictionary{})), "not of kind 3"},
+      {rawFrame(static_cast<wire::FrameKind>(200), ""), "not of kind 200"},
   };
   Door door;
   WireEnd client = door.client();
   for (const auto& [bytes, why] : cases) {
     client.send(bytes);
     const Received reply = client.next();
-    EXPECT_EQ(reply.kind, FrameKind::reply);
+    EXPECT_EQ(reply.kind, wire::FrameKind::reply);
     EXPECT_EQ(reply.callID, 9u);
     EXPECT_THAT(reply.description(), HasSubstr(why));
   }
@@ -46,11 +46,11 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
 
 TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   Door door;
-  std::vector<StringReply> held;  // the connection's thread's until the journal says so
-  door.onMessage = [&](std::uint16_t category, StringReply reply) {
+  std::vector<wire::StringReply> held;  // the connection's thread's until the journal says so
+  door.onMessage = [&](std::uint16_t category, wire::StringReply reply) {
     if (category == 1) return;  // dropped
     if (category == 2) {
-      const StringReply copy = reply;
+      const wire::StringReply copy = reply;
       reply("first");
       return copy("second");
     }
@@ -77,9 +77,9 @@ TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
 }
 
 TEST(Replies, MayOutliveTheConnection) {
-  StringReply late;
+  wire::StringReply late;
   Door door;
-  door.onMessage = [&](std::uint16_t, StringReply reply) { late = std::move(reply); };
+  door.onMessage = [&](std::uint16_t, wire::StringReply reply) { late = std::move(reply); };
   WireEnd client = door.client();
   client.send(messageFrame(1));
   client.hangUp(SHUT_WR);

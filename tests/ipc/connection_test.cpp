@@ -13,8 +13,8 @@ struct Pipe {
   Pipe() {
     int ends[2];
     EXPECT_EQ(::pipe2(ends, O_CLOEXEC), 0);
-    read = platform::FileDescriptor(ends[0]);
-    write = platform::FileDescriptor(ends[1]);
+    read = FileDescriptor(ends[0]);
+    write = FileDescriptor(ends[1]);
   }
   // Every copy of the writing end was closed: the reader sees the end.
   bool writersGone() {
@@ -22,15 +22,15 @@ struct Pipe {
     pollfd watched{read.get(), POLLIN, 0};
     return ::poll(&watched, 1, 20'000) == 1 && (watched.revents & POLLHUP) != 0;
   }
-  platform::FileDescriptor read;
-  platform::FileDescriptor write;
+  FileDescriptor read;
+  FileDescriptor write;
 };
 
 // The client reads why it is refused (after what may have come before), and then the end.
 std::string refusalOf(WireEnd& client) {
   Received last = client.next();
-  if (last.kind == FrameKind::hello || last.kind == FrameKind::reply) last = client.next();
-  EXPECT_EQ(last.kind, FrameKind::refusal);
+  if (last.kind == wire::FrameKind::hello || last.kind == wire::FrameKind::reply) last = client.next();
+  EXPECT_EQ(last.kind, wire::FrameKind::refusal);
   EXPECT_TRUE(client.atEnd());
   return last.description();
 }
@@ -41,12 +41,13 @@ TEST(Connection, EndsWhenTheClientBreaksTheProtocolAndSaysHow) {
       {messageFrame(1), "The first frame must be a hello (kind 1), not of kind 2."},
       {helloFrame(2), "The client speaks wire version 2, the daemon speaks version 1."},
       {helloFrame("1"), "\"wire\" must be a number"},
-      {rawFrame(FrameKind::hello, ""), "The hello cannot be read"},
+      {rawFrame(wire::FrameKind::hello, ""), "The hello cannot be read"},
       {"GET / HTTP/1.1\r\n\r\n", "A frame of 1195725856 bytes"},
-      {hello + rawFrame(FrameKind::call, "", kFrameBodyLimit + 1), "at most 1048576"},
-      {hello + rawFrame(FrameKind::largeCall, "", kLargeFrameBodyLimit + 1), "at most 16777216"},
-      {hello + rawFrame(FrameKind::call, "", 4, 2), "with 2 descriptors"},
-      {hello + rawFrame(FrameKind::call, "body", {}, 1), "A frame announced a descriptor, and none came."},
+      {hello + rawFrame(wire::FrameKind::call, "", wire::kFrameBodyLimit + 1), "at most 1048576"},
+      {hello + rawFrame(wire::FrameKind::largeCall, "", wire::kLargeFrameBodyLimit + 1), "at most 16777216"},
+      {hello + rawFrame(wire::FrameKind::call, "", 4, 2), "with 2 descriptors"},
+      {hello + rawFrame(wire::FrameKind::call, "body", {}, 1),
+       "A frame announced a descriptor, and none came."},
   };
   Door door;
   for (const auto& [bytes, why] : cases) {
@@ -64,7 +65,7 @@ TEST(Connection, TakesADescriptorWithItsFrameAndKeepsNone) {
   Pipe first;
   Pipe second;
   const auto frame = [](std::uint32_t id) {
-    return callFrame(id, kUploadFile, {{"path", "/a"}}, FrameKind::call, 1);
+    return callFrame(id, kUploadFile, {{"path", "/a"}}, wire::FrameKind::call, 1);
   };
   client.send(frame(1), {first.write.get()});
   EXPECT_EQ(client.next().results(), R"({"uploaded":true})");
@@ -88,7 +89,7 @@ TEST(Connection, TakesADescriptorWithItsFrameAndKeepsNone) {
 // A door whose messages of category 1 wait at a gate.
 struct GatedDoor : Door {
   GatedDoor() {
-    onMessage = [this](std::uint16_t category, StringReply reply) {
+    onMessage = [this](std::uint16_t category, wire::StringReply reply) {
       if (category == 1) gate.pass();
       reply("served");
     };
@@ -104,15 +105,15 @@ struct GatedDoor : Door {
 
 TEST(Replies, FromElsewhereThatNobodyReadsEndTheConnection) {
   Door door;
-  std::vector<StringReply> held;
-  door.onMessage = [&](std::uint16_t, StringReply reply) {
+  std::vector<wire::StringReply> held;
+  door.onMessage = [&](std::uint16_t, wire::StringReply reply) {
     held.push_back(std::move(reply));
     if (held.size() == 300) door.journal.add("all held");
   };
   WireEnd client = door.client();
   for (std::uint32_t id = 1; id <= 300; ++id) client.send(messageFrame(id));
   ASSERT_TRUE(door.journal.waitFor("all held"));
-  for (const StringReply& reply : held) reply(std::string(10'000, 'x'));
+  for (const wire::StringReply& reply : held) reply(std::string(10'000, 'x'));
   ASSERT_TRUE(door.journal.waitFor("end"));
   EXPECT_GE(door.counters.value("connection ended: the client does not read its replies"), 1u);
   held.clear();  // before the counters go
@@ -161,7 +162,7 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
   ASSERT_TRUE(door.journal.waitFor("end"));
   // The place is free as soon as the thread has ended; until then the refusal is right.
   const auto deadline = within(kPatience);
-  for (FrameKind answer{}; answer != FrameKind::hello;) {
+  for (wire::FrameKind answer{}; answer != wire::FrameKind::hello;) {
     ASSERT_LT(std::chrono::steady_clock::now(), deadline);
     WireEnd again = door.stranger();
     again.send(helloFrame());
@@ -180,7 +181,7 @@ TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
   const std::string most = callFrame(
       1, kSend, {{"category", 1}, {"type", 1}, {"payload", Dictionary{{"x", std::string(900'000, 'x')}}}});
   WireEnd boasting = door.client();  // what a header declares holds nothing
-  boasting.send(rawFrame(FrameKind::largeCall, "", kLargeFrameBodyLimit));
+  boasting.send(rawFrame(wire::FrameKind::largeCall, "", wire::kLargeFrameBodyLimit));
   boasting.waitUntilRead();
   boasting.send("x");
   boasting.waitUntilRead();

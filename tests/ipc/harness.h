@@ -8,7 +8,7 @@
 #include "fakes/recorded_log.h"
 #include "fakes/wire.h"
 #include "ipc/listener.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
 namespace veltrad::ipc_test {
 
@@ -25,34 +25,35 @@ inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds ti
 
 // Writes each message into the journal and answers it or leaves that to the test; answers uploads, and
 // nothing else.
-class RecordingSession final : public ClientSessionInterface {
+class RecordingSession final : public wire::ClientSessionInterface {
  public:
-  using OnMessage = std::function<void(std::uint16_t category, StringReply)>;
+  using OnMessage = std::function<void(std::uint16_t category, wire::StringReply)>;
   RecordingSession(Journal& journal, OnMessage onMessage)
       : _journal(journal), _onMessage(std::move(onMessage)) {}
 
-  bool setSessionInfo(OptionalDictionary, OptionalDictionary, std::optional<Array>, bool) override {
+  bool setSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::optional<Array>,
+                      bool) override {
     return true;
   }
-  void startConfigWithCompletionHandler(NamesReply) override {}
-  void fetchStatesWithUserInfo(OptionalDictionary, NamesReply) override {}
-  void fetchDisplayURL(StringReply) override {}
-  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, OptionalDictionary payload,
-                               StringReply reply) override {
+  void startConfigWithCompletionHandler(wire::NamesReply) override {}
+  void fetchStatesWithUserInfo(wire::OptionalDictionary, wire::NamesReply) override {}
+  void fetchDisplayURL(wire::StringReply) override {}
+  void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, wire::OptionalDictionary payload,
+                               wire::StringReply reply) override {
     _journal.add("sendMessage " + std::to_string(category) + " " + std::to_string(type) + " " +
-                 (payload ? writeJSON(*payload) : "none"));
+                 (payload ? formats::writeJSON(*payload) : "none"));
     _onMessage ? _onMessage(category, std::move(reply)) : reply("done");
   }
-  void sendMessageWithDictionary(Dictionary, StringReply) override {}
-  void flushMessagesWithCompletion(FlushReply) override {}
-  void finishSessionWithReply(StringReply) override {}
-  void uploadFileAtPath(std::string, std::string, BooleanReply reply) override { reply(true); }
-  void uploadLogData(Array, UploadLogDataReply reply) override {
+  void sendMessageWithDictionary(Dictionary, wire::StringReply) override {}
+  void flushMessagesWithCompletion(wire::FlushReply) override {}
+  void finishSessionWithReply(wire::StringReply) override {}
+  void uploadFileAtPath(std::string, std::string, wire::BooleanReply reply) override { reply(true); }
+  void uploadLogData(Array, wire::UploadLogDataReply reply) override {
     _journal.add("uploadLogData");
     reply(true, std::nullopt);
   }
-  void sendMessageWithSessionInfo(OptionalDictionary, OptionalDictionary, std::uint16_t, std::uint16_t,
-                                  OptionalDictionary, StringReply) override {}
+  void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
+                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply) override {}
   void end() override { _journal.add("end"); }
   std::string description() const override { return "recording session"; }
 
@@ -62,33 +63,35 @@ class RecordingSession final : public ClientSessionInterface {
 };
 
 inline std::string callFrame(std::uint32_t id, const char* op, Dictionary arguments = {},
-                             FrameKind kind = FrameKind::call, std::uint8_t descriptors = 0) {
-  return ipc::makeFrame(kind, id, Dictionary{{"op", op}, {"args", std::move(arguments)}}, descriptors);
+                             wire::FrameKind kind = wire::FrameKind::call, std::uint8_t descriptors = 0) {
+  return wire::makeFrame(kind, id, Dictionary{{"op", op}, {"args", std::move(arguments)}}, descriptors);
 }
 inline std::string messageFrame(std::uint32_t id, int category = 1, int type = 1) {
   return callFrame(id, kSend, {{"category", category}, {"type", type}});
 }
 inline std::string helloFrame(Value wire = 1) {
-  return ipc::makeFrame(FrameKind::hello, 0, Dictionary{{"library", "8.0"}, {"wire", std::move(wire)}});
+  return wire::makeFrame(wire::FrameKind::hello, 0,
+                         Dictionary{{"library", "8.0"}, {"wire", std::move(wire)}});
 }
 
 // A door in a directory of its own that lets everybody in.
-class Door : public ListenerDelegate {
+class Door : public ipc::ListenerDelegate {
  public:
   explicit Door(std::size_t most = 4096, std::size_t mostOfOneUser = 1024, platform::MemoryBounds bounds = {})
       : memory(bounds) {
-    const Dictionary rule{{"uid", ::getuid()}, {"entitlements", Dictionary{{kVeltraEntitlement, true}}}};
+    const Dictionary rule{{"uid", ::getuid()},
+                          {"entitlements", Dictionary{{wire::kVeltraEntitlement, true}}}};
     _files.put("entitlements.plist", writeBinaryPropertyList(Array{rule}));
     auto socket = ipc::openServiceSocket(root, std::nullopt);
     EXPECT_TRUE(socket.ok()) << (socket.ok() ? "" : socket.error());
-    _listener = std::make_unique<Listener>(
+    _listener = std::make_unique<ipc::Listener>(
         ipc::ListenerOptions{std::move(socket.value()), _entitlements, lentFiles, counters, memory,
                              root.entitlementsPath(), most, mostOfOneUser},
         *this);
     EXPECT_TRUE(_listener->resume());
   }
 
-  bool listener(Listener&, const std::shared_ptr<Connection>& connection) override {
+  bool listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) override {
     connection->setExportedObject(std::make_shared<RecordingSession>(journal, onMessage));
     connection->setInterruptionHandler([this] { journal.add("interrupted"); });
     connection->setInvalidationHandler([this] { journal.add("invalidated"); });
@@ -101,7 +104,7 @@ class Door : public ListenerDelegate {
   WireEnd client() {
     WireEnd client = stranger();
     client.send(helloFrame());
-    EXPECT_EQ(writeJSON(client.next().body), R"({"daemon":"8.0","wire":1})");
+    EXPECT_EQ(formats::writeJSON(client.next().body), R"({"daemon":"8.0","wire":1})");
     return client;
   }
   std::size_t stop(std::chrono::milliseconds time = kPatience) { return _listener->invalidate(within(time)); }
@@ -115,9 +118,9 @@ class Door : public ListenerDelegate {
 
  private:
   FakeFileStore _files;
-  platform::Entitlements _entitlements{_files, "entitlements.plist"};
+  ipc::Entitlements _entitlements{_files, "entitlements.plist"};
   platform::LentFiles lentFiles;
-  std::unique_ptr<Listener> _listener;
+  std::unique_ptr<ipc::Listener> _listener;
 };
 
 }  // namespace veltrad::ipc_test

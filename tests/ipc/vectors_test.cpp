@@ -8,7 +8,7 @@
 namespace veltrad::ipc_test {
 namespace {
 
-using ipc::makeFrame;
+using wire::makeFrame;
 
 // Every fence "```hex NAME" of the document.
 std::map<std::string, std::string> documentedFrames() {
@@ -35,22 +35,26 @@ TEST(Vectors, OfTheDocumentAreWhatTheCodeWrites) {
   const Dictionary payload{{"codec", "opus"}, {"seconds", 12.5}, {"muted", false}};
   const std::map<std::string, std::string> written{
       {"client-hello", helloFrame()},
-      {"daemon-hello", makeFrame(FrameKind::hello, 0, {{"wire", 1}, {"daemon", "8.0"}})},
+      {"daemon-hello", wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", 1}, {"daemon", "8.0"}})},
       {"call", callFrame(1, kSend, {{"category", 5}, {"type", 1}, {"payload", payload}})},
-      {"call-without-reply", makeFrame(FrameKind::call, 0, {{"op", "startConfigWithCompletionHandler:"}})},
-      {"call-with-descriptor", callFrame(0x01020304, kUploadFile, {{"path", "/a"}}, FrameKind::call, 1)},
-      {"large-call", callFrame(2, kUploadLogData, {{"data", Array{"one", 2}}}, FrameKind::largeCall)},
-      {"reply", makeFrame(FrameKind::reply, 1, {{"results", Dictionary{{"reply", "queued \u2713"}}}})},
-      {"reply-none", makeFrame(FrameKind::reply, 1, {{"results", Dictionary{}}})},
-      {"reply-error", makeFrame(FrameKind::reply, 1, error("The daemon gave no reply."))},
-      {"event", makeFrame(FrameKind::event, 0,
-                          {{"op", "sendMessageToClient:timestamp:category:type:payload:"},
-                           {"args", Dictionary{{"timestamp", 1.5}, {"category", 65535}, {"type", 2}}}})},
+      {"call-without-reply",
+       wire::makeFrame(wire::FrameKind::call, 0, {{"op", "startConfigWithCompletionHandler:"}})},
+      {"call-with-descriptor",
+       callFrame(0x01020304, kUploadFile, {{"path", "/a"}}, wire::FrameKind::call, 1)},
+      {"large-call", callFrame(2, kUploadLogData, {{"data", Array{"one", 2}}}, wire::FrameKind::largeCall)},
+      {"reply",
+       wire::makeFrame(wire::FrameKind::reply, 1, {{"results", Dictionary{{"reply", "queued \u2713"}}}})},
+      {"reply-none", wire::makeFrame(wire::FrameKind::reply, 1, {{"results", Dictionary{}}})},
+      {"reply-error", wire::makeFrame(wire::FrameKind::reply, 1, error("The daemon gave no reply."))},
+      {"event",
+       wire::makeFrame(wire::FrameKind::event, 0,
+                       {{"op", "sendMessageToClient:timestamp:category:type:payload:"},
+                        {"args", Dictionary{{"timestamp", 1.5}, {"category", 65535}, {"type", 2}}}})},
       {"remove-event",
-       makeFrame(FrameKind::event, 0,
-                 {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", 0x01020304}}}})},
-      {"refusal", makeFrame(FrameKind::refusal, 0,
-                            error("The client speaks wire version 2, the daemon speaks version 1."))},
+       wire::makeFrame(wire::FrameKind::event, 0,
+                       {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", 0x01020304}}}})},
+      {"refusal", wire::makeFrame(wire::FrameKind::refusal, 0,
+                                  error("The client speaks wire version 2, the daemon speaks version 1."))},
   };
   EXPECT_EQ(documentedFrames(), written);
 }

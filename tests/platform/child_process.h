@@ -10,7 +10,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
 namespace veltrad {
 
@@ -35,7 +35,7 @@ class ChildProcess {
       ::_exit(0);
     }
     ::close(ends[1]);
-    const platform::FileDescriptor in(ends[0]);
+    const FileDescriptor in(ends[0]);
     for (char c = 0; ::read(in.get(), &c, 1) == 1;) said += c;
     int status = 0;
     ::waitpid(pid, &status, 0);

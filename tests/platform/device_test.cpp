@@ -1,9 +1,9 @@
 // What the device says of itself.
 #include <gmock/gmock.h>
 
-#include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
+#include "formats/property_list.h"
 #include "platform/device_properties.h"
 
 namespace veltrad::platform {
@@ -14,13 +14,13 @@ constexpr const char* kList = "/root/etc/veltrad/device.plist";
 
 class MachinePropertiesTest : public ::testing::Test {
  protected:
-  void put(const Dictionary& list) { _files.put(kList, writeXMLPropertyList(list)); }
+  void put(const Dictionary& list) { _files.put(kList, formats::writeXMLPropertyList(list)); }
 
   Text value(std::string_view key) { return _properties.value(key).value(); }
 
   RecordedLog _log;
   FakeFileStore _files;
-  MachineProperties _properties{_files, kList};
+  platform::MachineProperties _properties{_files, kList};
 };
 
 TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
@@ -57,13 +57,13 @@ TEST_F(MachinePropertiesTest, DuringAShortageWhatWasLastReadServesOrNothing) {
   _files.put("/etc/os-release", "VERSION_ID=12\n");
   for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName"}) {
     for (const char* path : {kList, "/etc/os-release", "/proc/cpuinfo"})
-      _files.failReads(path, FileFailure::Kind::shortage);
+      _files.failReads(path, platform::FileFailure::Kind::shortage);
     EXPECT_FALSE(_properties.value(key)) << key;
     _files.failReads(kList, {});
     EXPECT_EQ(_properties.value(key).ok(), key == std::string("SerialNumber")) << key;
     for (const char* path : {"/etc/os-release", "/proc/cpuinfo"}) _files.failReads(path, {});
   }
-  MachineProperties properties{_files, kList};
+  platform::MachineProperties properties{_files, kList};
   const auto all = [&] {
     std::string texts;
     for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName", "BuildVersion"})

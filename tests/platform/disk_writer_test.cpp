@@ -8,9 +8,9 @@
 #include <latch>
 #include <string>
 
-#include "base/json.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
+#include "formats/json.h"
 #include "platform/child_process.h"
 #include "platform/counters.h"
 #include "platform/counters_file.h"
@@ -18,7 +18,7 @@
 namespace veltrad::platform {
 namespace {
 
-using Put = DiskWriter::Queue::Put;
+using Put = platform::DiskWriter::Queue::Put;
 using Clock = std::chrono::steady_clock;
 
 Clock::time_point soon() {
@@ -28,9 +28,9 @@ Clock::time_point soon() {
 TEST(DiskWriter, AStalledJobHoldsUpNobodyAndEachQueueHasItsOwnBound) {
   std::latch stalled(1);
   std::string order;
-  DiskWriter writer;
-  DiskWriter::Queue a(writer, 10), b(writer, 10);
-  const auto put = [&](DiskWriter::Queue& queue, char name, std::size_t bytes) {
+  platform::DiskWriter writer;
+  platform::DiskWriter::Queue a(writer, 10), b(writer, 10);
+  const auto put = [&](platform::DiskWriter::Queue& queue, char name, std::size_t bytes) {
     return queue.put([&order, name] { order += name; }, bytes);
   };
   EXPECT_EQ(a.put([&] { stalled.wait(); }, 11), Put::taken);  // larger than the bound, but alone
@@ -59,8 +59,8 @@ TEST(DiskWriter, AThreadThatCannotBeStartedIsStartedByALaterJob) {
     rlimit limit{};
     ::getrlimit(RLIMIT_NPROC, &limit);
     const rlimit none{0, limit.rlim_max};
-    DiskWriter writer;
-    DiskWriter::Queue queue(writer, 10);
+    platform::DiskWriter writer;
+    platform::DiskWriter::Queue queue(writer, 10);
     ::setrlimit(RLIMIT_NPROC, &none);
     say(queue.put([&] { say("never"); }, 1) == Put::noThread ? "no thread" : "a thread");
     ::setrlimit(RLIMIT_NPROC, &limit);
@@ -73,9 +73,9 @@ TEST(DiskWriter, AThreadThatCannotBeStartedIsStartedByALaterJob) {
 TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
   RecordedLog log;
   FakeFileStore files;
-  Counters counters;
-  DiskWriter writer;
-  CountersFile file(counters, files, writer, "/run/c", 1'700'000'000.5);
+  platform::Counters counters;
+  platform::DiskWriter writer;
+  platform::CountersFile file(counters, files, writer, "/run/c", 1'700'000'000.5);
   const auto written = [&] {
     EXPECT_TRUE(file.writeSoon());
     EXPECT_TRUE(writer.drain(soon()));
@@ -83,8 +83,9 @@ TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
   };
   counters.count("message dropped: the queue is full", 42);
   counters.count("nothing", 0);
-  files.failWrites(FileFailure::Kind::noSpace);
-  log.expectLine(LogLevel::error, "The counters could not be written: /run/c: No space left on device");
+  files.failWrites(platform::FileFailure::Kind::noSpace);
+  log.expectLine(platform::LogLevel::error,
+                 "The counters could not be written: /run/c: No space left on device");
   EXPECT_EQ(written() + written(), 0);
   files.failWrites({});
   EXPECT_EQ(written(), 1);
@@ -93,7 +94,7 @@ TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
 
   // While the disk is stalled one write waits, and it writes what has been counted until it runs.
   std::latch begun(1), stalled(1);
-  DiskWriter::Queue other(writer, 1);
+  platform::DiskWriter::Queue other(writer, 1);
   other.put([&] { begun.count_down(), stalled.wait(), counters.count("last"); }, 1);
   begun.wait();
   for (int i = 0; i < 3; ++i) counters.count("first"), file.writeSoon();
@@ -105,7 +106,7 @@ TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
       {"pid", static_cast<int>(::getpid())},
       {"started", 1'700'000'000.5},
       {"counts", Dictionary{{"first", 3}, {"last", 1}, {"message dropped: the queue is full", 42}}}};
-  EXPECT_EQ(parseJSON(files.bytes("/run/c").value_or("")).value(), Value(expected));
+  EXPECT_EQ(formats::parseJSON(files.bytes("/run/c").value_or("")).value(), Value(expected));
 }
 
 }  // namespace

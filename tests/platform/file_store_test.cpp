@@ -15,15 +15,15 @@ namespace {
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::UnorderedElementsAre;
-using Kind = FileFailure::Kind;
+using Kind = platform::FileFailure::Kind;
 
 constexpr std::size_t kMost = 1u << 20;
 
 class DiskFileStoreTest : public ::testing::Test {
  protected:
-  FileStamp stampOf(const std::string& path) { return _files.stamp(path).value(); }
+  platform::FileStamp stampOf(const std::string& path) { return _files.stamp(path).value(); }
   TemporaryDirectory _directory;
-  DiskFileStore _files;
+  platform::DiskFileStore _files;
 };
 
 TEST_F(DiskFileStoreTest, ReplacesWholeWithTheModeAskedForAndLeavesNothingElse) {

@@ -8,7 +8,7 @@
 #include <stdlib.h>
 #include <unistd.h>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
 namespace veltrad::platform {
 namespace {
@@ -21,7 +21,7 @@ class LogTest : public ::testing::Test {
   }
   static void start() {
     ::setenv("VELTRA_LOG", "info", 1);
-    VeltraLogging::startLogging("veltrad", "Daemon");
+    platform::VeltraLogging::startLogging("veltrad", "Daemon");
   }
   void SetUp() override {
     forgetEnvironment();
@@ -32,8 +32,8 @@ class LogTest : public ::testing::Test {
     ::close(ends[1]);
   }
   void TearDown() override {
-    VeltraLogging::stopLogging();
-    log::threshold = static_cast<int>(LogLevel::info);
+    platform::VeltraLogging::stopLogging();
+    log::threshold = static_cast<int>(platform::LogLevel::info);
     ::dup2(_saved.get(), STDERR_FILENO);
     forgetEnvironment();
   }

@@ -10,22 +10,22 @@
 namespace veltrad::platform {
 namespace {
 
-using enum MemoryUse;
+using enum platform::MemoryUse;
 
 TEST(MemoryBudget, HoldsEachBoundToTheByteAndGetsAllBack) {
-  const MemoryBounds alone{100, 90, 80, 190, 180}, crowded{100, 90, 80, 110, 105};
+  const platform::MemoryBounds alone{100, 90, 80, 190, 180}, crowded{100, 90, 80, 110, 105};
   const struct {
-    MemoryBounds bounds;
-    MemoryUse use;
+    platform::MemoryBounds bounds;
+    platform::MemoryUse use;
     std::size_t mine, others, fits;  // bytes of that use already charged, and what then fits
   } table[] = {{alone, working, 30, 0, 70},    {alone, kept, 30, 0, 60},
                {alone, unfinished, 30, 0, 50}, {crowded, working, 30, 50, 30},
                {crowded, kept, 30, 50, 25},    {crowded, unfinished, 30, 50, 25}};
   for (const auto& c : table) {
-    MemoryBudget budget(c.bounds);
+    platform::MemoryBudget budget(c.bounds);
     const auto mine = budget.accountOf(1), other = budget.accountOf(2);
     ASSERT_EQ(budget.accountOf(1), mine);
-    std::vector<std::optional<Charge>> charges;
+    std::vector<std::optional<platform::Charge>> charges;
     charges.push_back(mine->tryCharge(c.mine, c.use));
     charges.push_back(other->tryCharge(c.others, c.use));
     for (const bool again : {false, true}) {  // a refusal has left nothing behind
@@ -43,11 +43,11 @@ TEST(MemoryBudget, HoldsEachBoundToTheByteAndGetsAllBack) {
 }
 
 TEST(MemoryBudget, ChargesMoveGrowShrinkAndJoin) {
-  MemoryBudget budget;
+  platform::MemoryBudget budget;
   const auto account = budget.accountOf(1);
-  Charge one = *account->tryCharge(10, kept), empty;
+  platform::Charge one = *account->tryCharge(10, kept), empty;
   EXPECT_TRUE(empty.resize(0) && !empty.resize(1));
-  Charge moved = std::move(one);
+  platform::Charge moved = std::move(one);
   EXPECT_TRUE(moved.resize(30) && moved.resize(25));
   moved.add(*account->tryCharge(5, kept));
   empty.add(std::move(moved));
@@ -58,7 +58,7 @@ TEST(MemoryBudget, ChargesMoveGrowShrinkAndJoin) {
 }
 
 // Parts of ten bytes, each with its turn.
-struct Kept final : Evictable {
+struct Kept final : platform::Evictable {
   std::optional<std::uint64_t> oldestTurn() const override {
     return turns.empty() ? std::nullopt : std::optional(turns.front());
   }
@@ -67,11 +67,12 @@ struct Kept final : Evictable {
     ASSERT_TRUE(charge.resize(charge.bytes() - 10));
   }
   std::vector<std::uint64_t> turns;
-  Charge charge;
+  platform::Charge charge;
 };
 
 TEST(MemoryBudget, TheOldestPartsOfAUserMakeRoomAndNobodyElses) {
-  MemoryBudget budget({.user = 100, .userKept = 50, .userUnfinished = 50, .all = 200, .allKept = 200});
+  platform::MemoryBudget budget(
+      {.user = 100, .userKept = 50, .userUnfinished = 50, .all = 200, .allKept = 200});
   const auto account = budget.accountOf(1), other = budget.accountOf(2);
   const auto first = std::make_shared<Kept>(), second = std::make_shared<Kept>();
   account->add(std::make_shared<Kept>());  // has gone
@@ -89,13 +90,14 @@ TEST(MemoryBudget, TheOldestPartsOfAUserMakeRoomAndNobodyElses) {
   EXPECT_TRUE(account->keepMore(*more, 25));
   EXPECT_EQ(first->turns, std::vector<std::uint64_t>({4}));
   EXPECT_TRUE(second->turns.empty());
-  const auto working = account->tryCharge(50, MemoryUse::working);
+  const auto working = account->tryCharge(50, platform::MemoryUse::working);
   const auto last = account->keep(10);  // the last of them goes
   EXPECT_TRUE(last && first->turns.empty() && !account->dropOldest() && !account->keep(1));
 }
 
 TEST(MemoryBudget, WhoWaitsIsWokenByWhatIsPaidBackOrGivesUp) {
-  MemoryBudget budget({.user = 100, .userKept = 50, .userUnfinished = 50, .all = 120, .allKept = 100});
+  platform::MemoryBudget budget(
+      {.user = 100, .userKept = 50, .userUnfinished = 50, .all = 120, .allKept = 100});
   const auto account = budget.accountOf(1), other = budget.accountOf(2);
   EXPECT_FALSE(account->waitToCharge(101, [] { return ADD_FAILURE() << "never fits", true; }));
   auto held = other->tryCharge(60, working);
@@ -110,8 +112,8 @@ TEST(MemoryBudget, WhoWaitsIsWokenByWhatIsPaidBackOrGivesUp) {
 }
 
 TEST(LimitedLine, IsSaidOnceAndThenCountedOnceASecond) {
-  LimitedLine line("posts");
-  const LimitedLine::Time begin{};
+  platform::LimitedLine line("posts");
+  const platform::LimitedLine::Time begin{};
   using Said = std::optional<std::string>;
   const std::tuple<int, const char*, Said> story[] = {
       {0, "a", "a"},     {1, "b", {}},

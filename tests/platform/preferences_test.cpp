@@ -15,10 +15,10 @@
 namespace veltrad::platform {
 namespace {
 
-using Level = LogLevel;
-using Kind = FileFailure::Kind;
+using Level = platform::LogLevel;
+using Kind = platform::FileFailure::Kind;
 
-constexpr std::string_view kDomain = kVeltraPreferenceDomain;
+constexpr std::string_view kDomain = platform::kVeltraPreferenceDomain;
 constexpr const char* kPath = "/preferences/com.florn.veltra.plist";
 
 class FilePreferencesTest : public ::testing::Test {
@@ -27,7 +27,7 @@ class FilePreferencesTest : public ::testing::Test {
 
   RecordedLog _log;
   FakeFileStore _files;
-  FilePreferences _preferences{_files, "/preferences"};
+  platform::FilePreferences _preferences{_files, "/preferences"};
 };
 
 TEST_F(FilePreferencesTest, PutsAMalformedFileAsideWithOneLineAndGoesOn) {
@@ -55,27 +55,29 @@ TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {
 
 TEST_F(FilePreferencesTest, ATextThatCannotBeStoredLastsAsLongAsTheProcess) {
   put({{"empty", ""}});
-  EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", randomUUIDText)->size(), 36u);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "empty", platform::randomUUIDText)->size(), 36u);
   _files.failWrites(Kind::noSpace);
   _log.expectLine(Level::error,
                   "Preference not stored: /preferences/com.florn.veltra.plist: No space left on device");
-  const auto made = _preferences.textOrStore(kDomain, "id", randomUUIDText);
-  EXPECT_EQ(_preferences.textOrStore(kDomain, "id", randomUUIDText), made);
+  const auto made = _preferences.textOrStore(kDomain, "id", platform::randomUUIDText);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "id", platform::randomUUIDText), made);
   EXPECT_EQ(_preferences.text(kDomain, "id"), made);
   _files.failWrites({});
-  EXPECT_NE(FilePreferences(_files, "/preferences").textOrStore(kDomain, "id", randomUUIDText), made);
+  EXPECT_NE(
+      platform::FilePreferences(_files, "/preferences").textOrStore(kDomain, "id", platform::randomUUIDText),
+      made);
 }
 
 // Another identifier than the stored one is never made, kept or stored.
 TEST_F(FilePreferencesTest, AShortageIsNoAnswer) {
   put({{"id", "stored"}});
   for (const bool stampsFail : {false, true}) {
-    FilePreferences preferences(_files, "/preferences");
+    platform::FilePreferences preferences(_files, "/preferences");
     _files.runShort(true, stampsFail);
     EXPECT_FALSE(preferences.lookUp(kDomain, "id"));
-    EXPECT_EQ(preferences.textOrStore(kDomain, "id", randomUUIDText), std::nullopt);
+    EXPECT_EQ(preferences.textOrStore(kDomain, "id", platform::randomUUIDText), std::nullopt);
     _files.runShort(false);
-    EXPECT_EQ(preferences.textOrStore(kDomain, "id", randomUUIDText), "stored");
+    EXPECT_EQ(preferences.textOrStore(kDomain, "id", platform::randomUUIDText), "stored");
     _files.runShort(true, stampsFail);
     EXPECT_EQ(preferences.lookUp(kDomain, "id").ok(), !stampsFail);
     _files.runShort(false);
@@ -90,27 +92,27 @@ TEST_F(FilePreferencesTest, AShortageIsNoAnswer) {
   // Nothing is stored, and that is known: what is made now is stored as soon as it can be.
   _files.runShort(true);
   _log.expectLine(Level::error, "Preference not stored, its file cannot be read: /preferences/");
-  const auto made = _preferences.textOrStore(kDomain, "new", randomUUIDText);
+  const auto made = _preferences.textOrStore(kDomain, "new", platform::randomUUIDText);
   ASSERT_TRUE(made);
-  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", randomUUIDText), made);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", platform::randomUUIDText), made);
   _files.runShort(false);
-  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", randomUUIDText), made);
-  EXPECT_EQ(FilePreferences(_files, "/preferences").text(kDomain, "new"), made);
+  EXPECT_EQ(_preferences.textOrStore(kDomain, "new", platform::randomUUIDText), made);
+  EXPECT_EQ(platform::FilePreferences(_files, "/preferences").text(kDomain, "new"), made);
 }
 
 TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
   RecordedLog log;
   TemporaryDirectory directory;
-  DiskFileStore files;
-  FilePreferences preferences(files, directory.path());
+  platform::DiskFileStore files;
+  platform::FilePreferences preferences(files, directory.path());
   std::vector<std::optional<std::string>> texts(4);
   std::vector<std::thread> callers;
   for (auto& text : texts) {
-    callers.emplace_back([&] { text = preferences.textOrStore(kDomain, "id", randomUUIDText); });
+    callers.emplace_back([&] { text = preferences.textOrStore(kDomain, "id", platform::randomUUIDText); });
   }
   for (auto& caller : callers) caller.join();
   EXPECT_EQ(std::set(texts.begin(), texts.end()).size(), 1u);
-  EXPECT_EQ(FilePreferences(files, directory.path()).text(kDomain, "id"), texts[0]);
+  EXPECT_EQ(platform::FilePreferences(files, directory.path()).text(kDomain, "id"), texts[0]);
 }
 
 }  // namespace

@@ -28,7 +28,7 @@ TEST(Sandbox, LeavesWhatTheProfileNamesAndTheNetwork) {
   const auto path = [&](std::string_view name) { return directory.path(name); };
   for (const char* name : {"r", "w", "w/below", "other"}) std::filesystem::create_directory(path(name));
   for (const char* name : {"r/x", "w/x", "other/x", "file"}) directory.write(name, "x");
-  const SandboxProfile profile{
+  const platform::SandboxProfile profile{
       "test", {path("r"), path("file"), path("missing"), "/usr/lib", "/proc"}, {path("w")}};
   const ChildProcess child([&](const auto& say) {
     const auto expect = [&](const char* what, int error, int expected) {
@@ -38,7 +38,7 @@ TEST(Sandbox, LeavesWhatTheProfileNamesAndTheNetwork) {
       return errorOf(::open(path(name).c_str(), flags, 0600));
     };
     ::unsetenv("VELTRA_SANDBOX");
-    const auto entered = enterSandbox(profile);
+    const auto entered = platform::enterSandbox(profile);
     say(entered ? entered.value().line : entered.error());
     expect("read a tree", opening("r/x", O_RDONLY), 0);
     expect("list a tree", opening("r", O_RDONLY | O_DIRECTORY), 0);
@@ -74,7 +74,7 @@ TEST(Sandbox, RequiredIsFatalWhereTheKernelCannotAndAnUnknownChoiceEverywhere) {
   const ChildProcess child([&](const auto& say) {
     for (const char* choice : {"maybe", "required"}) {
       ::setenv("VELTRA_SANDBOX", choice, 1);
-      const auto entered = enterSandbox({"test", {"/usr/lib"}, {}});
+      const auto entered = platform::enterSandbox({"test", {"/usr/lib"}, {}});
       say(entered ? entered.value().inForce ? "in force" : "without" : entered.error().substr(0, 24));
     }
   });

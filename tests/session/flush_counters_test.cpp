@@ -26,7 +26,7 @@ TEST(FlushCounters, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
                                          {2, {"!a", "!b"}, 1},
                                          {2, {"a", "!b"}, 2},
                                          {1, {"a", "late", "!later"}, 1}}) {
-    FlushCounters counters;
+    session::FlushCounters counters;
     std::vector<Text> given;
     const auto flush = counters.begin(c.backends, [&](const Text& answer, const auto& error) {
       given.push_back(error ? "!" + error->description : answer);
@@ -37,14 +37,14 @@ TEST(FlushCounters, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
       const bool error = c.answers[i] && c.answers[i]->starts_with('!');
       counters.finished(
           *flush, error ? std::nullopt : c.answers[i],
-          error ? std::optional(makeReportingError(c.answers[i]->substr(1), -1)) : std::nullopt);
+          error ? std::optional(wire::makeReportingError(c.answers[i]->substr(1), -1)) : std::nullopt);
       EXPECT_EQ(given.size(), c.calledBy > 0 && i + 1 >= c.calledBy ? 1u : 0u);
     }
     if (c.calledBy > 0) {
       EXPECT_EQ(given.at(0), c.answers[c.calledBy - 1]);
     }
   }
-  FlushCounters counters;  // nobody waits
+  session::FlushCounters counters;  // nobody waits
   counters.finished(*counters.begin(1, nullptr), "a", std::nullopt);
 }
 

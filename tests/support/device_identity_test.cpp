@@ -13,7 +13,7 @@ namespace {
 
 TEST(DeviceIdentity, CopiesAUniqueIdOnlyWhereItFits) {
   FakeDeviceProperties service;
-  DeviceIdentity device(service);
+  support::DeviceIdentity device(service);
   const std::string before(41, 'z');
   for (const std::size_t length : {1u, 40u, 41u, 100u}) {
     const std::string id(length, 'a');
@@ -28,7 +28,7 @@ TEST(DeviceIdentity, IsInternalByTheExactWordOnce) {
   for (const std::string releaseType : {"Internal", "internal", "Internal ", ""}) {
     FakeDeviceProperties service;
     service.set("ReleaseType", releaseType);
-    DeviceIdentity device(service);
+    support::DeviceIdentity device(service);
     const bool internal = releaseType == "Internal";
     std::vector<std::thread> first;
     for (int i = 0; i < 4; ++i) first.emplace_back([&] { EXPECT_EQ(device.isInternalBuild(), internal); });

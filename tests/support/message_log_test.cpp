@@ -28,7 +28,9 @@ class MessageLogTest : public ::testing::Test {
   std::string nameAt(std::int64_t seconds, const char* zeros = "") const {
     return std::string("veltrad_") + zeros + std::to_string(seconds) + "_messageLog.diag";
   }
-  std::string dateAt(std::int64_t seconds) const { return "(" + dateDescription(double(seconds)) + ") "; }
+  std::string dateAt(std::int64_t seconds) const {
+    return "(" + support::dateDescription(double(seconds)) + ") ";
+  }
   void write(const std::string& text = "text %@ 5%") {
     _messages.writeToLogFile("[%@ -> %@", {"b", text});
     EXPECT_TRUE(_writer.drain(std::chrono::steady_clock::now() + std::chrono::seconds(10)));
@@ -41,7 +43,7 @@ class MessageLogTest : public ::testing::Test {
   FakeClock _clock{{_now, 900'000}};
   platform::Counters _counters;
   platform::DiskWriter _writer;
-  MessageLogFile _messages{_clock, _place.path(), _writer, _counters};
+  support::MessageLogFile _messages{_clock, _place.path(), _writer, _counters};
   const std::string _current = _place.path(nameAt(_now));
 };
 

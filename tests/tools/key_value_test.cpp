@@ -1,7 +1,7 @@
 // What a word KEY=VALUE of veltractl's command line stands for.
 #include <gtest/gtest.h>
 
-#include "base/json.h"
+#include "formats/json.h"
 #include "tools/ctl/key_value.h"
 
 namespace veltrad::ctl {
@@ -11,7 +11,7 @@ TEST(KeyValue, numbersAndBooleansAreToldFromTexts) {
   Array found;
   for (const char* text : {"12", "-3", "-0.5", "1e3", "18446744073709551615", "true", "false"})
     found.push_back(parseKeyValue(std::string("k=") + text).value().second);
-  EXPECT_EQ(writeJSON(found), "[12,-3,-0.5,1000.0,18446744073709551615,true,false]");
+  EXPECT_EQ(formats::writeJSON(found), "[12,-3,-0.5,1000.0,18446744073709551615,true,false]");
   for (const char* text :
        {"True", "007", "+5", " 5", "1.", "8.0.1", "-", "", "a=b", "null", "{}", "NaN", "0x10"})
     EXPECT_EQ(parseKeyValue(std::string("k=") + text).value(), Dictionary::Entry("k", text));

@@ -8,10 +8,10 @@
 #include <utility>
 
 #include "base/base64.h"
-#include "base/json.h"
-#include "base/property_list.h"
 #include "config/storebag_container.h"
 #include "fakes/temporary_directory.h"
+#include "formats/json.h"
+#include "formats/property_list.h"
 #include "storebag/signing.h"
 
 namespace veltrad {
@@ -58,19 +58,19 @@ TEST_F(StorebagCommands, KeygenMakesAPairAndNeverOverwritesOne) {
 }
 
 TEST_F(StorebagCommands, SignsEveryFormSoThatItVerifiesAndShows) {
-  const std::string json = writeJSON(kStorebag);
+  const std::string json = formats::writeJSON(kStorebag);
   for (const std::string& bytes :
-       {writeXMLPropertyList(kStorebag), writeBinaryPropertyList(kStorebag), json}) {
+       {formats::writeXMLPropertyList(kStorebag), writeBinaryPropertyList(kStorebag), json}) {
     const std::string in = file("in", bytes), out = path("out");
     const Outcome sign = storebag::sign(privateKey, in, out);
     ASSERT_TRUE(sign.done) << sign.text;
     EXPECT_EQ(storebag::verify(publicKey, out).text, out + ": the signature holds\n");
-    const auto decoded = decodeStorebagContainer(parseStorebagContainer(read("out")).value());
+    const auto decoded = config::decodeStorebagContainer(config::parseStorebagContainer(read("out")).value());
     ASSERT_TRUE(decoded);
-    EXPECT_EQ(decoded->bag, bytes == json ? writeXMLPropertyList(kStorebag) : bytes);
+    EXPECT_EQ(decoded->bag, bytes == json ? formats::writeXMLPropertyList(kStorebag) : bytes);
     for (const std::string& shown : {in, out}) {
       EXPECT_EQ(storebag::show(shown, true).text, json + "\n");
-      EXPECT_EQ(parseJSON(storebag::show(shown, false).text).value(), Value(kStorebag));
+      EXPECT_EQ(formats::parseJSON(storebag::show(shown, false).text).value(), Value(kStorebag));
       EXPECT_EQ(storebag::lint(shown).text, "nothing found\n");
     }
   }
@@ -85,9 +85,10 @@ TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
   const std::pair<std::string, const char*> inputs[] = {
       {"[1,2]", "no dictionary"},
       {"{\"a\":", "JSON, byte"},
-      {writeXMLPropertyList(Array{}), "no dictionary"},
-      {writeXMLPropertyList(deep), "beyond what the daemon takes"},
-      {writeXMLPropertyList(Dictionary{{"note", std::string(1'800'000, 'x')}}), "the daemon takes 2097152"},
+      {formats::writeXMLPropertyList(Array{}), "no dictionary"},
+      {formats::writeXMLPropertyList(deep), "beyond what the daemon takes"},
+      {formats::writeXMLPropertyList(Dictionary{{"note", std::string(1'800'000, 'x')}}),
+       "the daemon takes 2097152"},
   };
   for (const auto& [bytes, reason] : inputs) {
     EXPECT_THAT(refusal(storebag::sign(privateKey, file("in", bytes), path("out"))), HasSubstr(reason));
@@ -102,9 +103,9 @@ TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
 TEST_F(StorebagCommands, VerifyNamesTheStepThatFails) {
   const auto key = SigningKey::load(privateKey);
   ASSERT_TRUE(key);
-  const std::string bag = writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
+  const std::string bag = formats::writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
   const std::string signature = encodeBase64(key.value().sign(bag));
-  const auto list = [](const Dictionary& entries) { return writeXMLPropertyList(entries); };
+  const auto list = [](const Dictionary& entries) { return formats::writeXMLPropertyList(entries); };
   const std::pair<std::string, const char*> files[] = {
       {"hello", "the container is no property list"},
       {list({{"signature", signature}}), "the text \"bag\" is missing"},

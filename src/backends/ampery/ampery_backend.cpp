@@ -1,10 +1,10 @@
 // The energy log's back end. The session's thread.
 #include "backends/ampery/ampery_backend.h"
 
+#include "backends/ampery/energy_log.h"
 #include "platform/counters.h"
-#include "platform/energy_log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::uint32_t kEnergyLogClient = 28;
@@ -37,4 +37,4 @@ std::optional<std::string> AmperyBackend::sendMessage(const Dictionary* payload,
   return std::nullopt;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -8,7 +8,7 @@
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Reads nothing of its section. The energy log outlives it.
 class AmperyBackend final : public VeltraBackend {
@@ -28,8 +28,8 @@ class AmperyBackend final : public VeltraBackend {
                 const std::string& productFamily);
 
   // Constant after construction.
-  platform::EnergyLog& _energyLog;
+  EnergyLog& _energyLog;
   platform::Counters& _counters;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

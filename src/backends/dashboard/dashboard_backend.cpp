@@ -16,7 +16,7 @@
 #include "platform/log.h"
 #include "platform/memory_budget.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::chrono::milliseconds kDefaultPeriod{500};
@@ -42,9 +42,9 @@ bool namesServer(const Dictionary& profile) {
 }
 
 // One more socket; those that linger for others make room for it.
-std::optional<platform::UDPSocket> openSocket(DashboardQueues& queues) {
+std::optional<UDPSocket> openSocket(DashboardQueues& queues) {
   for (;;) {
-    auto socket = platform::UDPSocket::open();
+    auto socket = UDPSocket::open();
     if (socket.ok()) return std::move(socket).value();
     const bool tableIsFull = socket.error() == EMFILE || socket.error() == ENFILE;
     if (tableIsFull && queues.endOldest()) continue;
@@ -53,7 +53,7 @@ std::optional<platform::UDPSocket> openSocket(DashboardQueues& queues) {
   }
 }
 
-bool useReliableUDP(platform::UDPSocket& socket) {
+bool useReliableUDP(UDPSocket& socket) {
   const auto failure = socket.bindToAnyPort();
   if (failure) logError("DashboardBackend(useReliableUDP): can't bind socket, %d", *failure);
   return !failure;
@@ -73,13 +73,13 @@ struct Server {
 
 Server serverOf(const Dictionary* profile, const std::optional<std::string>& serverIP,
                 std::uint16_t serverPort) {
-  if (!profile) return {serverIP ? platform::parseIPv4Address(*serverIP, serverPort) : std::nullopt};
-  return {platform::parseIPv4Address(*profile->string("ip"), *profile->uint16("port")),
-          profile->contains("reliable"), periodOf(profile)};
+  if (!profile) return {serverIP ? parseIPv4Address(*serverIP, serverPort) : std::nullopt};
+  return {parseIPv4Address(*profile->string("ip"), *profile->uint16("port")), profile->contains("reliable"),
+          periodOf(profile)};
 }
 
 // Null: one error line has said why.
-std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, platform::UDPSocket socket,
+std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSocket socket,
                                             const Server& server) {
   if (!server.address) {
     logError("DashboardBackend(initWithName): can't resolve server IP");
@@ -90,8 +90,8 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, platf
     logError("DashboardBackend(initWithName): socket connect() failed.");
     return nullptr;
   }
-  platform::WorkPool& pool = making.services.pool;
-  auto timer = platform::PoolTimer::make(pool);
+  WorkPool& pool = making.services.pool;
+  auto timer = PoolTimer::make(pool);
   if (!timer) {
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
@@ -208,4 +208,4 @@ void DashboardBackend::cleanup() {
   _networkProcQueue->cleanup();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -12,7 +12,7 @@
 #include "backends/dashboard/network_proc_queue.h"
 #include "backends/dashboard/reporting_packet.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class DashboardQueues;
 class LogDataUploads;
@@ -75,4 +75,4 @@ class DashboardBackend final : public VeltraBackend {
   bool _cleanedUp = false;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -5,7 +5,7 @@
 
 #include "backends/dashboard/network_proc_queue.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 std::shared_ptr<NetworkProcQueue> DashboardQueues::join(const Route& route) {
   std::shared_ptr<NetworkProcQueue> queue;
@@ -69,4 +69,4 @@ std::shared_ptr<NetworkProcQueue> DashboardQueues::takeOneTooMany(std::int64_t u
   return leaves;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -14,7 +14,7 @@
 
 #include "base/mutex.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class NetworkProcQueue;
 
@@ -62,4 +62,4 @@ class DashboardQueues {
   std::map<Route, std::weak_ptr<NetworkProcQueue>> _shared GUARDED_BY(_mutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -3,7 +3,7 @@
 
 #include <algorithm>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 std::optional<DeliverySchedule::Time> DeliverySchedule::next(Time now, bool waiting) {
   _nextTick = std::nullopt;
@@ -32,4 +32,4 @@ DeliverySchedule::Verdict DeliverySchedule::afterTick(Time now, bool waiting) {
   return Verdict::lastResortScheduled;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -5,7 +5,7 @@
 #include <chrono>
 #include <optional>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Ticks stand at multiples of the period since the back end was made, and are needed only while datagrams
 // wait or a clean-up is under way.
@@ -40,4 +40,4 @@ class DeliverySchedule {
   std::optional<Time> _lastResort;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

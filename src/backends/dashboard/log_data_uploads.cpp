@@ -5,11 +5,11 @@
 
 #include "base/property_list.h"
 #include "base/text.h"
+#include "http/http_client.h"
 #include "platform/counters.h"
-#include "platform/http_client.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 // A place is a short text; what is longer is none.
@@ -53,16 +53,16 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
 }
 
 Result<std::string, std::string> LogDataUploads::post(const std::string& url, std::string archive) {
-  platform::HTTPRequest request;
-  request.method = platform::HTTPRequest::Method::post;
-  request.lane = platform::HTTPRequest::Lane::logData;
+  http::HTTPRequest request;
+  request.method = http::HTTPRequest::Method::post;
+  request.lane = http::HTTPRequest::Lane::logData;
   request.url = url;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body = std::move(archive);
   request.mostResponseBytes = kMostAnswerBytes;
-  platform::HTTPResult result = _http.perform(std::move(request));
+  http::HTTPResult result = _http.perform(std::move(request));
   if (!result.ok()) return Failure{result.error().description};
   return std::move(result.value().body);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

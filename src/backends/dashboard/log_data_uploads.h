@@ -7,19 +7,21 @@
 #include "base/result.h"
 #include "base/value.h"
 
-namespace veltrad {
-
-namespace platform {
-class Counters;
+namespace veltrad::http {
 class HTTPClient;
-}  // namespace platform
+}  // namespace veltrad::http
+
+namespace veltrad::platform {
+class Counters;
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
 
 // One for all dashboard back ends, which it outlives. The memory of the array and its archive is charged with
 // the call that brought it.
 class LogDataUploads {
  public:
-  LogDataUploads(platform::HTTPClient& http, platform::Counters& counters)
-      : _http(http), _counters(counters) {}
+  LogDataUploads(http::HTTPClient& http, platform::Counters& counters) : _http(http), _counters(counters) {}
 
   // Where the server says that it stored the array, whatever its status; none, after one error line, when it
   // could not be asked or said nothing.
@@ -29,8 +31,8 @@ class LogDataUploads {
   // The answer's body, or why there is none.
   Result<std::string, std::string> post(const std::string& url, std::string archive);
 
-  platform::HTTPClient& _http;
+  http::HTTPClient& _http;
   platform::Counters& _counters;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -4,7 +4,7 @@
 #include <algorithm>
 #include <iterator>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 // Ticks before a retransmission, by the retransmissions done so far.
@@ -95,4 +95,4 @@ bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
   return true;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

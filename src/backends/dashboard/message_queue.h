@@ -13,7 +13,7 @@
 #include "backends/dashboard/udp_packet_to_send.h"
 #include "platform/memory_budget.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // A datagram that could not be sent whole waits for the next tick. With reliable UDP every other one waits
 // for its acknowledgement: unless it comes, the datagram is sent again on the 2nd, 5th, 10th and 19th tick
@@ -68,4 +68,4 @@ class MessageQueue {
   std::optional<SentCopies> _copies;  // where it is shared
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -10,7 +10,7 @@
 #include "platform/counters.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::string_view kLost = "datagram lost: its back end ended before it was sent";
@@ -26,8 +26,8 @@ DeliverySchedule::Time now() {
 }
 }  // namespace
 
-NetworkProcQueue::NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<platform::PoolTimer> timer,
-                                   const Kind& kind, std::shared_ptr<platform::MemoryAccount> account,
+NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
+                                   std::shared_ptr<platform::MemoryAccount> account,
                                    std::shared_ptr<DashboardQueues> queues, platform::Counters& counters)
     : _counters(counters),
       _kind(kind),
@@ -45,9 +45,9 @@ NetworkProcQueue::~NetworkProcQueue() {
   _readSource.reset();  // before the socket that it watches
 }
 
-bool NetworkProcQueue::startReading(platform::WorkPool& pool) {
+bool NetworkProcQueue::startReading(WorkPool& pool) {
   const Lock held(_mutex);
-  _readSource = platform::ReadSource::make(pool, _socket.descriptor());
+  _readSource = ReadSource::make(pool, _socket.descriptor());
   if (_readSource) awaitReading();
   return _readSource != nullptr;
 }
@@ -194,4 +194,4 @@ void NetworkProcQueue::cleanupSources() {
   _socketCharge.reset();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

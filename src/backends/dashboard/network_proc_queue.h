@@ -11,19 +11,20 @@
 
 #include "backends/dashboard/delivery_schedule.h"
 #include "backends/dashboard/message_queue.h"
+#include "backends/dashboard/pool_timer.h"
+#include "backends/dashboard/read_source.h"
+#include "backends/dashboard/udp_socket.h"
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
-#include "platform/pool_timer.h"
-#include "platform/read_source.h"
-#include "platform/udp_socket.h"
 
-namespace veltrad {
+namespace veltrad::platform {
+class Counters;
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
 
 class DashboardQueues;
-namespace platform {
-class Counters;
 class WorkPool;
-}  // namespace platform
 
 // A serial queue: one thing at a time, in the order in which it came, on the thread that brings it; a first
 // transmission never blocks and costs no change of thread. The armed timer keeps it alive after its back ends
@@ -38,14 +39,14 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::chrono::milliseconds period{};
   };
   // For one back end. `socket` is connected. `account`: null, nobody pays.
-  NetworkProcQueue(platform::UDPSocket socket, std::unique_ptr<platform::PoolTimer> timer, const Kind& kind,
+  NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
                    std::shared_ptr<platform::MemoryAccount> account, std::shared_ptr<DashboardQueues> queues,
                    platform::Counters& counters);
   // Counts the datagrams that still wait as lost.
   ~NetworkProcQueue();
 
   // Acknowledgements are read from now on; false: they cannot be.
-  bool startReading(platform::WorkPool& pool);
+  bool startReading(WorkPool& pool);
   // No lock is held: older things of the user may have to make room.
   void tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
   // One back end more, which calls cleanup(); false: it has stopped already.
@@ -77,14 +78,14 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   const std::shared_ptr<DashboardQueues> _queues;
 
   Mutex _mutex BACKEND_LOCK{LockRank::backend};
-  platform::UDPSocket _socket GUARDED_BY(_mutex);
+  UDPSocket _socket GUARDED_BY(_mutex);
   MessageQueue _messageQueue GUARDED_BY(_mutex);
   DeliverySchedule _schedule GUARDED_BY(_mutex);
-  std::unique_ptr<platform::PoolTimer> _timer GUARDED_BY(_mutex);  // null: stopped
+  std::unique_ptr<PoolTimer> _timer GUARDED_BY(_mutex);  // null: stopped
   bool _armed GUARDED_BY(_mutex) = false;
   std::size_t _backEnds GUARDED_BY(_mutex) = 1;
   std::optional<platform::Charge> _socketCharge GUARDED_BY(_mutex);
-  std::unique_ptr<platform::ReadSource> _readSource GUARDED_BY(_mutex);
+  std::unique_ptr<ReadSource> _readSource GUARDED_BY(_mutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

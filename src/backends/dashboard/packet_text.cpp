@@ -7,7 +7,7 @@
 
 #include "backends/dashboard/value_description.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 struct Item {
@@ -69,4 +69,4 @@ void PacketText::put(std::string_view text) {
   _cut = _cut || fits < text.size();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

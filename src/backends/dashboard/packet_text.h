@@ -6,7 +6,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Writes into the 1,024 bytes of a packet's text field: at most 1,023 bytes, what is beyond is cut off. The
 // field must outlive it.
@@ -33,4 +33,4 @@ class PacketText {
   bool _cut = false;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -7,7 +7,7 @@
 
 #include "backends/dashboard/packet_text.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Every number of more than one byte is big-endian.
 struct tagReportingPacketHeader {
@@ -38,4 +38,4 @@ inline constexpr std::uint8_t kPacketKind = 1;
 inline constexpr std::uint16_t kPacketFlagReliable = 1;
 inline constexpr std::uint16_t kPacketFlagNoProfile = 2;  // the server was not taken from a storebag section
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -3,7 +3,7 @@
 
 #include <algorithm>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 void SentCopies::sent(std::uint64_t datagram, std::uint16_t eventNumber) {
   _copies.push_back({datagram, _tick, eventNumber});
@@ -24,4 +24,4 @@ void SentCopies::tick() {
   while (!_copies.empty() && _tick - _copies.front().tick > kTicks) _copies.pop_front();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

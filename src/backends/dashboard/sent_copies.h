@@ -6,7 +6,7 @@
 #include <deque>
 #include <optional>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // An acknowledgement names an event number alone. It answers the oldest copy of that number that was sent and
 // not answered yet, so that each copy confirms once at most: the second answer to a datagram that was sent
@@ -37,4 +37,4 @@ class SentCopies {
   std::uint64_t _tick = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -10,13 +10,13 @@
 #include "base/text.h"
 #include "config/client_types.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 std::string writeLocalLog(const tagReportingPacket& packet) {
   const tagReportingPacketHeader& header = packet.header;
   char device[sizeof header.deviceID + 1] = {};
   std::memcpy(device, header.deviceID, sizeof header.deviceID);
-  const char* code = senderCodeForComponentType(header.componentType);
+  const char* code = config::senderCodeForComponentType(header.componentType);
   const auto clientVersion = static_cast<std::uint16_t>(~be16toh(header.invertedClientVersion));
 
   char line[1152];
@@ -29,4 +29,4 @@ std::string writeLocalLog(const tagReportingPacket& packet) {
   return std::string(withoutIncompleteEnd({line, written}));
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

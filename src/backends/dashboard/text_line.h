@@ -5,10 +5,10 @@
 
 #include "backends/dashboard/reporting_packet.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // From the packet alone: time, device, sender code, client version, session, event, method, response code,
 // text. A character that the packet's end cut is left out.
 std::string writeLocalLog(const tagReportingPacket& packet);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -8,7 +8,7 @@
 
 #include "platform/memory_budget.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class UDPPacketToSend {
  public:
@@ -39,4 +39,4 @@ class UDPPacketToSend {
   int _numberOfRetransmits = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

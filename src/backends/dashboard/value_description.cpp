@@ -3,7 +3,7 @@
 
 #include <algorithm>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 std::size_t charactersOf(std::string_view text) {
@@ -20,4 +20,4 @@ ValueDescription descriptionForObject(const Value& value) {
   return description;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -8,7 +8,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Of a text it keeps a pointer only: the value must outlive it.
 class ValueDescription {
@@ -27,4 +27,4 @@ class ValueDescription {
 // Integers in decimal, reals in the shortest form that reads back the same, booleans 1 and 0.
 ValueDescription descriptionForObject(const Value& value);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -4,7 +4,7 @@
 #include "backends/backend.h"
 #include "backends/https/text_lists.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 // The first element whose "country" array holds the country, letter case respected; or null.
@@ -107,4 +107,4 @@ const char* reasonOf(ClientRefusal refusal) {
   return "";
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

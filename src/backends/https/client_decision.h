@@ -8,7 +8,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // What is known of the client, the device and the user at the time of the decision.
 struct ClientFacts {
@@ -54,4 +54,4 @@ ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts);
 // The counter's text of a refusal.
 const char* reasonOf(ClientRefusal refusal);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -8,7 +8,7 @@
 #include "backends/backend.h"
 #include "config/client_types.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 // Bit n stands for client type n: 7, 11 and 13.
@@ -25,7 +25,7 @@ double finiteOrMinusOne(double seconds) {
 }  // namespace
 
 std::string senderCode(std::int32_t compType) {
-  const char* code = senderCodeForComponentType(compType);
+  const char* code = config::senderCodeForComponentType(compType);
   return code ? code : "";
 }
 
@@ -70,4 +70,4 @@ Dictionary createEventDictfromPayload(const VeltraBackend& backend, const Dictio
   return event;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

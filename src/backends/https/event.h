@@ -8,7 +8,7 @@
 #include "base/value.h"
 #include "platform/clock.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class VeltraBackend;
 
@@ -28,4 +28,4 @@ Dictionary createEventDictfromPayload(const VeltraBackend& backend, const Dictio
 // On internal builds the client types 7, 11 and 13 report their numeric session ID.
 bool reportsNumericSessionID(bool isInternal, std::int32_t compType);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -1,14 +1,14 @@
 // The batch's counts and bounds.
 #include "backends/https/event_batch.h"
 
-#include "base/json.h"
+#include "formats/json.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 EventSize sizeOfEvent(const Dictionary& event) {
   // While a flush runs there are the compact text, the readable one and the compressed body.
   constexpr std::size_t kTexts = 3;
-  const std::size_t json = jsonBytesAtMost(event);
+  const std::size_t json = formats::jsonBytesAtMost(event);
   return {json, sizeof(Dictionary) + keptBytes(event) + kTexts * json};
 }
 
@@ -71,4 +71,4 @@ void EventBatch::unaccount(const EventSize& size) {
   _bytes.charged -= size.charged;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

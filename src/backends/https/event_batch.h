@@ -11,7 +11,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // What an event costs, in bytes.
 struct EventSize {
@@ -64,4 +64,4 @@ class EventBatch {
   std::map<std::int32_t, std::int32_t> _counts;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -4,10 +4,10 @@
 #include <optional>
 
 #include "backends/backend.h"
-#include "base/json.h"
 #include "base/text.h"
+#include "formats/json.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::int32_t kKeep = 0;
@@ -24,7 +24,8 @@ std::int32_t actionNamed(const std::string* name) {
 // then be removed: a field that was to be hashed never leaves in clear.
 std::optional<std::string> digestOf(const Value& value) {
   if (const std::string* text = value.asString()) return VeltraBackend::convertIntoSHA256(*text);
-  if (value.isNumber() || value.isBoolean()) return VeltraBackend::convertIntoSHA256(writeJSON(value));
+  if (value.isNumber() || value.isBoolean())
+    return VeltraBackend::convertIntoSHA256(formats::writeJSON(value));
   return std::nullopt;
 }
 }  // namespace
@@ -86,4 +87,4 @@ FilterTable::Outcome FilterTable::filterEvent(Dictionary& event) const {
   return outcome;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

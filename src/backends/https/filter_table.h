@@ -8,7 +8,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // One element of a client entry's "filters".
 struct filterTag {
@@ -42,4 +42,4 @@ class FilterTable {
   std::unordered_map<std::string, std::vector<std::size_t>> _recordsOfKey;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -3,7 +3,7 @@
 
 #include "platform/counters.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 HeldEvents::~HeldEvents() {
   const Lock held(_mutex);
@@ -90,4 +90,4 @@ std::size_t HeldEvents::settle() {
   return dropped;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -13,11 +13,11 @@
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
 
-namespace veltrad {
-
-namespace platform {
+namespace veltrad::platform {
 class Counters;
-}
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
 
 // Shared, so that the account may still ask it when its back end has gone. The counters outlive it.
 class HeldEvents final : public platform::Evictable {
@@ -64,4 +64,4 @@ class HeldEvents final : public platform::Evictable {
   std::string _sessionID GUARDED_BY(_mutex);  // since the first change
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -9,23 +9,23 @@
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
-#include "protocol/constants.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::uint16_t kSessionTypeStop = 1;
 
-const char* reasonOf(platform::HTTPError::Kind kind) {
+const char* reasonOf(http::HTTPError::Kind kind) {
   switch (kind) {
-    case platform::HTTPError::Kind::transport:
-    case platform::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
+    case http::HTTPError::Kind::transport:
+    case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
       return "event lost: the post failed";
-    case platform::HTTPError::Kind::tooMany:
+    case http::HTTPError::Kind::tooMany:
       return "event lost: too many posts under way";
-    case platform::HTTPError::Kind::shortage:
+    case http::HTTPError::Kind::shortage:
       return "event lost: no descriptor, thread or memory for its post";
-    case platform::HTTPError::Kind::stopping:
+    case http::HTTPError::Kind::stopping:
       return "event lost: the daemon stopped before the post ended";
   }
   return "event lost: the post failed";
@@ -171,12 +171,13 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     _services.counters.count("event dropped: flushed while the back end does not report", _held->discard());
   }
   if (_held->empty()) {
-    if (completion) completion(std::nullopt, makeReportingError("Nothing to flush", -1));
+    if (completion) completion(std::nullopt, wire::makeReportingError("Nothing to flush", -1));
     return std::nullopt;
   }
   const SharedDictionary userInfo = userInfoDict();
   if (requireUserInfo() && !userInfo) {
-    if (completion) completion(std::nullopt, makeReportingError("Can not flush: userInfo is required", -1));
+    if (completion)
+      completion(std::nullopt, wire::makeReportingError("Can not flush: userInfo is required", -1));
     return std::nullopt;
   }
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
@@ -199,7 +200,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   if (completion) {
     completionBytes = pretty ? pretty->size() : 0;
     whenPosted = [completion = std::move(completion), pretty](const std::optional<std::string>&,
-                                                              std::optional<ReportingError> error) {
+                                                              std::optional<wire::ReportingError> error) {
       completion(pretty, std::move(error));
     };
   }
@@ -246,18 +247,18 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
   const auto& url = meansRealtime(withFlag) ? _realtimePostURL : _postURL;
   if (!url) {
     _services.counters.count("event lost: postURL is nil", eventCount);
-    if (completion) completion(std::nullopt, makeReportingError("postURL is nil", -1));
+    if (completion) completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return;
   }
-  platform::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
+  http::HTTPRequest request = makePostRequest(*this, *url, std::move(json), eventMap);
   request.sequence = reinterpret_cast<std::uintptr_t>(this);
   request.charge = std::move(charge);
-  if (memoryAccount() && !request.charge.resize(platform::keptBytes(request) + completionBytes)) {
+  if (memoryAccount() && !request.charge.resize(http::keptBytes(request) + completionBytes)) {
     return refusePost(eventCount, completion);
   }
   auto self = std::static_pointer_cast<HTTPSPostBackend>(shared_from_this());
   const auto answered = [self, postedTo = *url, eventCount,
-                         completion = std::move(completion)](const platform::HTTPResult& result) {
+                         completion = std::move(completion)](const http::HTTPResult& result) {
     auto error = self->handleAnswer(result, postedTo, eventCount);
     if (completion) completion(std::nullopt, std::move(error));
   };
@@ -266,19 +267,20 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
 }
 
 void HTTPSPostBackend::refusePost(std::size_t eventCount, const FlushCompletion& completion) {
-  const platform::HTTPError refusal{platform::HTTPError::Kind::tooMany, "Too many posts under way"};
+  const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
   auto error = handleAnswer(Failure{refusal}, {}, eventCount);
   if (completion) completion(std::nullopt, std::move(error));
 }
 
-std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTTPResult& result,
-                                                             const std::string& url, std::size_t eventCount) {
-  std::optional<ReportingError> error;
+std::optional<wire::ReportingError> HTTPSPostBackend::handleAnswer(const http::HTTPResult& result,
+                                                                   const std::string& url,
+                                                                   std::size_t eventCount) {
+  std::optional<wire::ReportingError> error;
   if (!result.ok()) {
     const std::string& description = result.error().description;
     _errors.happened(description);
     logDebug("HTTPSPostBackend(postJsonMessage): posted to %s", url.c_str());
-    error = makeReportingError(description, -1);
+    error = wire::makeReportingError(description, -1);
   }
   const int status = result.ok() ? result.value().status : result.error().status;
   const PostVerdict verdict = verdictOfStatus(status);
@@ -288,7 +290,7 @@ std::optional<ReportingError> HTTPSPostBackend::handleAnswer(const platform::HTT
   const std::string text = fmt::sprintf("backend %s disabled by server %d return code", name(), status);
   logInfo("postJSONMessage: %s", text.c_str());
   setState(kBackendDisabled);
-  return makeReportingError(text, status);
+  return wire::makeReportingError(text, status);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -14,7 +14,7 @@
 #include "backends/https/post_errors.h"
 #include "backends/https/post_request.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class HTTPSPostBackend final : public VeltraBackend {
  public:
@@ -70,8 +70,8 @@ class HTTPSPostBackend final : public VeltraBackend {
                        std::size_t eventCount, platform::Charge charge, std::size_t completionBytes,
                        FlushCompletion completion);
   // HTTP thread. Nothing: the post ended without an error.
-  std::optional<ReportingError> handleAnswer(const platform::HTTPResult& result, const std::string& url,
-                                             std::size_t eventCount);
+  std::optional<wire::ReportingError> handleAnswer(const http::HTTPResult& result, const std::string& url,
+                                                   std::size_t eventCount);
 
   // Constant after construction.
   const BackendServices _services;
@@ -101,4 +101,4 @@ class HTTPSPostBackend final : public VeltraBackend {
 // 1 to 9.
 bool textMeansYes(const std::optional<std::string>& text);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -1,16 +1,16 @@
 // The HTTPS post backend: construction, and whether and how it reports for the current client.
 #include "backends/https/https_post_backend.h"
 #include "backends/https/text_lists.h"
-#include "base/json.h"
+#include "formats/json.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
 #include "platform/uuid.h"
-#include "protocol/constants.h"
-#include "protocol/veltra.h"
+#include "support/veltra.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 bool diagnosticLogSubmissionEnabled(platform::Preferences& preferences) {
@@ -83,8 +83,10 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
   const Array* clients = profile().array("clients");
   if (!clients) return kBackendDisabled;
   const SharedDictionary userInfo = userInfoDict();
-  const auto clientName = optionalText(userInfo ? userInfo->string(kVeltraUserInfoClientName) : nullptr);
-  const auto serviceName = optionalText(userInfo ? userInfo->string(kVeltraUserInfoServiceName) : nullptr);
+  const auto clientName =
+      optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoClientName) : nullptr);
+  const auto serviceName =
+      optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoServiceName) : nullptr);
   const Dictionary* entry = nullptr;
   for (const Value& client : *clients) {
     const Dictionary* candidate = client.asDictionary();
@@ -157,7 +159,7 @@ void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& 
                                   const std::optional<std::string>& country) const {
   const auto printed = [&entry](const char* key) {
     const Value* list = entry.find(key);
-    return list ? writeJSON(*list) : std::string("(null)");
+    return list ? formats::writeJSON(*list) : std::string("(null)");
   };
   switch (verdict.refusal) {
     case ClientRefusal::consentMissing:
@@ -243,4 +245,4 @@ void HTTPSPostBackend::resetBackendStateWithClient(const Dictionary* entry) {
   logDebug("setBackendStateWithClient: extras on internal is set to %d", _extrasOnInternal);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -5,11 +5,11 @@
 
 #include <cmath>
 
-#include "base/json.h"
 #include "base/text.h"
+#include "formats/json.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 enum class Fate { keep, toSeconds, remove };
@@ -44,7 +44,7 @@ std::string cut(const std::string& text) {
 
 std::string printed(const Value& value) {
   if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
-  const JSONExcerpt excerpt = excerptOfJSON(value, kMostPrinted);
+  const formats::JSONExcerpt excerpt = formats::excerptOfJSON(value, kMostPrinted);
   return excerpt.leftOut == 0 ? excerpt.text
                               : fmt::format("{}… ({} bytes cut)", excerpt.text, excerpt.leftOut);
 }
@@ -86,9 +86,9 @@ JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::v
   for (Dictionary& event : events) list.emplace_back(std::move(event));
   const Value envelope = Dictionary{
       {"clientId", clientID}, {"events", std::move(list)}, {"postTime", finiteOrMinusOne(postTime)}};
-  JSONMessage message{writeJSON(envelope), std::nullopt};
-  if (wantPretty) message.pretty = writeJSON(envelope, JSONStyle::pretty);
+  JSONMessage message{formats::writeJSON(envelope), std::nullopt};
+  if (wantPretty) message.pretty = formats::writeJSON(envelope, formats::JSONStyle::pretty);
   return message;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

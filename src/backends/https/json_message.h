@@ -7,7 +7,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // What JSON cannot carry is taken out of an event, in place: a date becomes its seconds since 1970 (-1.0 if
 // not finite); lists, dictionaries, raw bytes and numbers that are not finite are removed, each with one
@@ -24,4 +24,4 @@ struct JSONMessage {
 JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
                             bool wantPretty);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

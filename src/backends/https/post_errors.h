@@ -7,7 +7,7 @@
 #include "platform/limited_line.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // One for all back ends, so that many sessions make no more lines than one.
 class PostErrors {
@@ -24,4 +24,4 @@ class PostErrors {
   platform::LimitedLine _line{"posts"};
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -5,10 +5,10 @@
 
 #include "backends/backend.h"
 #include "backends/https/event.h"
-#include "protocol/constants.h"
 #include "support/gzip.h"
+#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 std::string orNull(const std::optional<std::string>& text) {
@@ -16,24 +16,24 @@ std::string orNull(const std::optional<std::string>& text) {
 }
 }  // namespace
 
-platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
-                                      std::optional<EventMap> eventMap) {
-  platform::HTTPRequest request;
-  request.method = platform::HTTPRequest::Method::post;
-  request.lane = platform::HTTPRequest::Lane::event;
+http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
+                                  std::optional<EventMap> eventMap) {
+  http::HTTPRequest request;
+  request.method = http::HTTPRequest::Method::post;
+  request.lane = http::HTTPRequest::Lane::event;
   request.url = std::move(url);
   request.keepsAnswer = false;
 
-  auto compressed = gzipDeflate(json);
+  auto compressed = support::gzipDeflate(json);
   const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
 
   auto& headers = request.headers;
   if (const SharedDictionary userInfo = backend.userInfoDict()) {
-    if (const std::string* name = userInfo->string(kVeltraUserInfoClientName)) {
+    if (const std::string* name = userInfo->string(wire::kVeltraUserInfoClientName)) {
       headers.emplace_back("X-VLT-Client-Name", *name);
     }
-    if (const std::string* name = userInfo->string(kVeltraUserInfoServiceName)) {
+    if (const std::string* name = userInfo->string(wire::kVeltraUserInfoServiceName)) {
       headers.emplace_back("X-VLT-Service-Name", *name);
     }
   }
@@ -68,4 +68,4 @@ PostVerdict verdictOfStatus(int status) {
   }
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

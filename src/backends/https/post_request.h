@@ -5,9 +5,9 @@
 #include <optional>
 #include <string>
 
-#include "platform/http_client.h"
+#include "http/http_client.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class VeltraBackend;
 
@@ -19,8 +19,8 @@ struct EventMap {
 
 // A POST of the JSON bytes, compressed when that is strictly shorter, with the headers that name the client,
 // the sender and the daemon. A text that is absent in "User-Agent" is "(null)".
-platform::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
-                                      std::optional<EventMap> eventMap);
+http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
+                                  std::optional<EventMap> eventMap);
 
 // What an answer's status means for the backend and for the events of the post.
 struct PostVerdict {
@@ -29,4 +29,4 @@ struct PostVerdict {
 };
 PostVerdict verdictOfStatus(int status);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

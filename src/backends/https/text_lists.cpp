@@ -5,7 +5,7 @@
 
 #include "base/text.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 bool matchExactStringWithList(const std::vector<std::string>& list,
                               const std::optional<std::string>& wholeString, bool whitelist) {
@@ -49,4 +49,4 @@ bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<st
          matchStringWithList(itemsBetweenCommas(entry.string("service")), serviceID, true);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -8,7 +8,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // Absent or empty list: `whitelist`. Absent text with a list: the opposite. Else whether an item equals the
 // text.
@@ -27,4 +27,4 @@ std::vector<std::string> textsOf(const Array* array);
 bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -6,10 +6,10 @@
 #include <exception>
 
 #include "backends/mivo/adaptor_payload.h"
-#include "platform/code_bundle.h"
+#include "backends/mivo/code_bundle.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 
@@ -30,7 +30,7 @@ std::optional<std::string> thrownBy(Call call) {
 
 }  // namespace
 
-Result<const veltra_adaptor_class*, std::string> adaptorClassNamed(platform::CodeBundle& bundle,
+Result<const veltra_adaptor_class*, std::string> adaptorClassNamed(CodeBundle& bundle,
                                                                    std::string_view name) {
   const auto object = bundle.object(kTable);
   if (!object.ok()) return Failure{object.error()};
@@ -78,4 +78,4 @@ std::optional<std::string> Adaptor::perform(std::string_view selector, std::uint
   return thrownBy([&] { operation.function(_instance, method, respCode, seen.dictionary()); });
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

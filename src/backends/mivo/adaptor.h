@@ -12,15 +12,12 @@
 #include "base/result.h"
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
-namespace platform {
 class CodeBundle;
-}
 
 // The class of that name, or what is wrong with the bundle. Any thread.
-Result<const veltra_adaptor_class*, std::string> adaptorClassNamed(platform::CodeBundle& bundle,
-                                                                   std::string_view name);
+Result<const veltra_adaptor_class*, std::string> adaptorClassNamed(CodeBundle& bundle, std::string_view name);
 
 // One instance. Whatever the bundle's code throws ends here.
 class Adaptor {
@@ -46,4 +43,4 @@ class Adaptor {
   void* const _instance;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

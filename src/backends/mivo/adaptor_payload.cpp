@@ -3,7 +3,7 @@
 
 #include <utility>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 AdaptorPayload::AdaptorPayload(const Dictionary* payload)
     : _present(payload != nullptr), _dictionary(payload ? valueOf(*payload) : veltra_adaptor_value{}) {}
@@ -73,4 +73,4 @@ veltra_adaptor_value AdaptorPayload::valueOf(const Dictionary& dictionary) {
   return seen;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

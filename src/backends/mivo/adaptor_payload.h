@@ -8,7 +8,7 @@
 
 #include "base/value.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // A tree of the plain structures of veltra/adaptor.h. Texts and data stay the dictionary's, which outlives
 // it.
@@ -32,4 +32,4 @@ class AdaptorPayload {
   veltra_adaptor_value _dictionary;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -4,7 +4,7 @@
 #include "platform/counters.h"
 #include "platform/log.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 constexpr std::uint32_t kAllowedClientTypes = 0x2880;  // a bit a type
@@ -66,4 +66,4 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
   return std::nullopt;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

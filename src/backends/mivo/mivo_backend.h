@@ -11,7 +11,7 @@
 #include "backends/backend_factory.h"
 #include "backends/mivo/adaptor.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // For client types 7, 11 and 13. Where the bundle or its class is missing there is a back end all the same,
 // without an adaptor: each of its messages is one error line. The bundle outlives it.
@@ -37,9 +37,9 @@ class MivoBackend final : public VeltraBackend {
 
   // Constant after initialisation.
   platform::Counters& _counters;
-  platform::CodeBundle& _clientBundle;
+  CodeBundle& _clientBundle;
   const veltra_adaptor_class* _mivoAdaptorClass = nullptr;
   std::unique_ptr<Adaptor> _mivoAdaptor;  // null: none could be had
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

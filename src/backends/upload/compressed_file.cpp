@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <cstdlib>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 bool CompressedFile::append(std::string_view bytes) {
   if (!_file) {
@@ -22,7 +22,7 @@ bool CompressedFile::append(std::string_view bytes) {
 }
 
 bool CompressedFile::open() {
-  platform::FileDescriptor file(::open(_directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
+  FileDescriptor file(::open(_directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
   if (!file.isOpen() && (errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL || errno == ENOENT)) {
     // A kill between the two calls leaves a name that is removed at the next start.
     std::string name = _directory + "/upload-XXXXXX.new";
@@ -30,7 +30,7 @@ bool CompressedFile::open() {
     if (file.isOpen()) ::unlink(name.c_str());
   }
   if (!file.isOpen()) return false;
-  _file = std::make_shared<platform::FileDescriptor>(std::move(file));
+  _file = std::make_shared<FileDescriptor>(std::move(file));
   return true;
 }
 
@@ -45,12 +45,12 @@ bool CompressedFile::write(std::string_view bytes) {
   return true;
 }
 
-void CompressedFile::become(platform::HTTPRequest& request) {
+void CompressedFile::become(http::HTTPRequest& request) {
   if (_file) {
-    request.fileBody = platform::FileBody{std::move(_file), _written};
+    request.fileBody = http::FileBody{std::move(_file), _written};
   } else {
     request.body = std::move(_start);
   }
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -7,10 +7,10 @@
 #include <string>
 #include <string_view>
 
-#include "platform/file_descriptor.h"
-#include "platform/http_client.h"
+#include "base/file_descriptor.h"
+#include "http/http_client.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 class CompressedFile {
  public:
@@ -22,7 +22,7 @@ class CompressedFile {
   // False: there is no room, and errno says why. Nothing stays behind.
   bool append(std::string_view bytes);
   // Moves all that was appended into the request.
-  void become(platform::HTTPRequest& request);
+  void become(http::HTTPRequest& request);
 
  private:
   bool open();
@@ -30,8 +30,8 @@ class CompressedFile {
 
   const std::string _directory;
   std::string _start;
-  std::shared_ptr<platform::FileDescriptor> _file;
+  std::shared_ptr<FileDescriptor> _file;
   std::uint64_t _written = 0;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

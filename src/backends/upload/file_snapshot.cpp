@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <cerrno>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 std::optional<FileSnapshot> FileSnapshot::of(int descriptor) {
   struct stat facts {};
@@ -45,4 +45,4 @@ bool FileSnapshot::changed() const {
          facts.st_mtim.tv_sec != _modified.tv_sec || facts.st_mtim.tv_nsec != _modified.tv_nsec;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

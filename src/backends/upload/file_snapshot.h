@@ -6,7 +6,7 @@
 #include <cstddef>
 #include <optional>
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // The daemon reads nothing but the bytes that were there at the beginning, whatever becomes of the file: one
 // that grows has no end, and one that others shorten must not be mapped.
@@ -41,4 +41,4 @@ class FileSnapshot {
   bool _endedEarly = false;
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -9,9 +9,9 @@
 #include <utility>
 
 #include "base/mutex.h"
-#include "platform/http_client.h"
+#include "http/http_client.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // One for all upload back ends, which it outlives: an upload holds a place, its buffers and its compressed
 // file from the first byte read to the server's answer. One user never holds all places.
@@ -39,7 +39,7 @@ class FileUploads {
 
   // Waits for a place: first come, first served, but nobody waits for a user who has his share. Nothing: the
   // daemon is stopping, which ends the wait even if no place is ever given back.
-  std::optional<Place> enter(User user, const platform::HTTPClient& http) {
+  std::optional<Place> enter(User user, const http::HTTPClient& http) {
     const auto self = arrive(user);
     while (true) {
       const bool stopping = http.stopping();  // takes a lock of its own
@@ -89,4 +89,4 @@ class FileUploads {
   Waiting _waiting GUARDED_BY(_mutex);  // in order of arrival
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -9,13 +9,13 @@
 #include "backends/upload/file_uploads.h"
 #include "backends/upload/upload_request.h"
 #include "base/text.h"
+#include "http/http_client.h"
 #include "platform/counters.h"
-#include "platform/http_client.h"
 #include "platform/lent_files.h"
 #include "platform/log.h"
 #include "support/gzip.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 
@@ -27,16 +27,16 @@ FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account
 }
 
 // Of an exchange that ended without an answer.
-const char* fateAfter(platform::HTTPError::Kind kind) {
+const char* fateAfter(http::HTTPError::Kind kind) {
   switch (kind) {
-    case platform::HTTPError::Kind::transport:
+    case http::HTTPError::Kind::transport:
       return "file lost: the exchange with the server failed";
-    case platform::HTTPError::Kind::tooLarge:
+    case http::HTTPError::Kind::tooLarge:
       return "file lost: the server's answer is too large";
-    case platform::HTTPError::Kind::tooMany:
-    case platform::HTTPError::Kind::shortage:
+    case http::HTTPError::Kind::tooMany:
+    case http::HTTPError::Kind::shortage:
       return "file lost: no exchange could begin for a shortage";
-    case platform::HTTPError::Kind::stopping:
+    case http::HTTPError::Kind::stopping:
       return "file lost: the daemon is stopping";
   }
   return "";
@@ -126,7 +126,7 @@ std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile
 bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::string& path) const {
   if (!lent) return false;
   const auto origin = lent->origin();
-  if (origin.kind != platform::FileOrigin::Kind::foreign) return false;
+  if (origin.kind != wire::FileOrigin::Kind::foreign) return false;
   logError(
       "UploadBackend(uploadFileAtPath): File %s lies on a file system of type %s, whose reads may never "
       "end: only a copy of it can be uploaded",
@@ -158,7 +158,7 @@ bool UploadBackend::compress(FileSnapshot& file, const std::string& path, Compre
     fate = "file lost: no room for its compressed bytes";
     return false;
   };
-  if (gzipDeflate(next, keep)) return true;
+  if (support::gzipDeflate(next, keep)) return true;
   if (fate) _counters.count(fate);
   return false;
 }
@@ -169,7 +169,7 @@ void UploadBackend::sayStopping() const {
 }
 
 // Says and counts how the exchange ended, too.
-bool UploadBackend::confirms(const std::string& url, const platform::HTTPResult& answer) const {
+bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& answer) const {
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",
              answer.ok() ? "(null)" : answer.error().description.c_str());
@@ -207,4 +207,4 @@ void UploadBackend::setUploadURL(std::optional<std::string> value) {
   _uploadURL = std::move(value);
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

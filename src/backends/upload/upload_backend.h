@@ -9,16 +9,17 @@
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
 #include "backends/upload/file_snapshot.h"
-#include "platform/http_client.h"
+#include "http/http_client.h"
 
-namespace veltrad {
+namespace veltrad::platform {
+class LentFile;
+class LentFiles;
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
 
 class CompressedFile;
 class FileUploads;
-namespace platform {
-class LentFile;
-class LentFiles;
-}  // namespace platform
 
 // Keeps nothing between uploads but its address. Sees a file through the descriptor that its client lent,
 // never by a path. Takes no part in message reporting.
@@ -45,13 +46,13 @@ class UploadBackend final : public VeltraBackend {
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
   bool compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const;
-  bool confirms(const std::string& url, const platform::HTTPResult& answer) const;
+  bool confirms(const std::string& url, const http::HTTPResult& answer) const;
   void sayStopping() const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
   // Constant after construction.
   FileUploads& _uploads;
-  platform::HTTPClient& _http;
+  http::HTTPClient& _http;
   platform::Counters& _counters;
   platform::LentFiles& _lentFiles;
   const std::string _scratchDirectory;
@@ -60,4 +61,4 @@ class UploadBackend final : public VeltraBackend {
   std::optional<std::string> _uploadURL GUARDED_BY(_urlMutex);
 };
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

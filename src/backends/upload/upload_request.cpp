@@ -5,7 +5,7 @@
 
 #include "base/text.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 namespace {
 
@@ -31,21 +31,21 @@ std::string_view lastPathComponent(std::string_view path) {
   return path.substr(path.rfind('/') + 1);
 }
 
-std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
-                                                   std::string_view path) {
+std::optional<http::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
+                                               std::string_view path) {
   const std::string name = std::string(lastPathComponent(path)) + ".gz";
-  platform::HTTPRequest request;
+  http::HTTPRequest request;
   request.url =
       fmt::sprintf("%s?uuid=%s&sequence=%u&description=%s%%20(Uploaded%%20by%%20PKV)&filename=%s&raw=true",
                    uploadURL, who.udid, who.sessionID, percentEncoded(kDescription, kKeptInQuery),
                    percentEncoded(name, kKeptInQuery));
   if (uploadURL.empty() || !mayBeURL(request.url)) return std::nullopt;
-  request.method = platform::HTTPRequest::Method::post;
-  request.lane = platform::HTTPRequest::Lane::upload;
+  request.method = http::HTTPRequest::Method::post;
+  request.lane = http::HTTPRequest::Lane::upload;
   request.headers = {{"Content-Type", "application/octet-stream"}, {"Content-Encoding", "gzip"}};
   request.leastBytesPerSecond = kLeastBytesPerSecond;
   request.mostResponseBytes = kMostAnswerBytes;
   return request;
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

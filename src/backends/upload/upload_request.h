@@ -6,9 +6,9 @@
 #include <string>
 #include <string_view>
 
-#include "platform/http_client.h"
+#include "http/http_client.h"
 
-namespace veltrad {
+namespace veltrad::backends {
 
 // What stands behind the last slash; slashes at the end do not count. "/" of the root.
 std::string_view lastPathComponent(std::string_view path);
@@ -19,7 +19,7 @@ struct UploadIdentity {
 };
 
 // The post of a gzipped file, but for its body. Nothing: `uploadURL` and the rest make no URL.
-std::optional<platform::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
-                                                   std::string_view path);
+std::optional<http::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
+                                               std::string_view path);
 
-}  // namespace veltrad
+}  // namespace veltrad::backends

@@ -4,13 +4,13 @@
 
 #include <fmt/format.h>
 
-#include "base/json.h"
+#include "formats/json.h"
 
 namespace veltrad::ctl {
 namespace {
 
 std::string quoted(std::string_view text) {
-  return writeJSON(Value(text));
+  return formats::writeJSON(Value(text));
 }
 
 std::string formatReply(const std::optional<std::string>& reply) {
@@ -71,11 +71,12 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
 
 std::string formatAggregated(const AggregatedCopy& copy) {
   const auto orNull = [](const std::optional<Dictionary>& dictionary) {
-    return dictionary ? writeJSON(*dictionary) : std::string("null");
+    return dictionary ? formats::writeJSON(*dictionary) : std::string("null");
   };
   return fmt::format(
       R"({{"op":"aggregated","sessionInfo":{},"timestamp":{},"category":{},"type":{},"payload":{}}})",
-      orNull(copy.sessionInfo), writeJSON(copy.timestamp), copy.category, copy.type, orNull(copy.payload));
+      orNull(copy.sessionInfo), formats::writeJSON(copy.timestamp), copy.category, copy.type,
+      orNull(copy.payload));
 }
 
 std::string formatMalformedLine(std::uint64_t line, std::string_view description) {

@@ -7,8 +7,8 @@
 #include <optional>
 #include <string>
 
+#include "base/file_descriptor.h"
 #include "base/mutex.h"
-#include "platform/file_descriptor.h"
 #include "tools/ctl/answers.h"
 #include "tools/ctl/interrupt.h"
 #include "tools/ctl/options.h"
@@ -64,7 +64,7 @@ class ClientSession {
   // Constant after construction.
   Interrupt& _interrupt;
   const CopyHandler _aggregated;
-  const platform::FileDescriptor _arrived;  // an event descriptor
+  const FileDescriptor _arrived;  // an event descriptor
   // Own thread only.
   veltra_session* _session = nullptr;
   // Guarded by _mutex.

@@ -8,8 +8,8 @@
 #include <cmath>
 #include <ctime>
 
-#include "base/json.h"
 #include "base/text.h"
+#include "formats/json.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -27,7 +27,7 @@ std::string formatTime(double secondsSince1970) {
 }  // namespace
 
 std::optional<CountersReport> readCounters(std::string_view json) {
-  const auto parsed = parseJSON(json);
+  const auto parsed = formats::parseJSON(json);
   const Dictionary* file = parsed ? parsed.value().asDictionary() : nullptr;
   const Value* pid = file ? file->find("pid") : nullptr;
   const Dictionary* counts = file ? file->dictionary("counts") : nullptr;
@@ -41,10 +41,10 @@ std::string formatCounters(const CountersReport& report) {
   std::string text = fmt::format("veltrad, process {}, started {}", report.pid, formatTime(report.started));
   if (report.counts.empty()) return text + "\nnothing counted yet";
   std::size_t width = std::string_view("count").size();
-  for (const auto& [reason, count] : report.counts) width = std::max(width, writeJSON(count).size());
+  for (const auto& [reason, count] : report.counts) width = std::max(width, formats::writeJSON(count).size());
   text += fmt::format("\n\n{:>{}}  reason", "count", width);
   for (const auto& [reason, count] : report.counts) {
-    text += fmt::format("\n{:>{}}  {}", writeJSON(count), width, escapedForLog(reason));
+    text += fmt::format("\n{:>{}}  {}", formats::writeJSON(count), width, escapedForLog(reason));
   }
   return text;
 }

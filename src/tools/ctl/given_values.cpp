@@ -5,7 +5,7 @@
 
 #include <algorithm>
 
-#include "base/json.h"
+#include "formats/json.h"
 
 namespace veltrad::ctl {
 
@@ -43,7 +43,7 @@ bool hasUnsendableKey(const Value& value) {
 }
 
 Result<Array, std::string> parseLogData(std::string_view text) {
-  const auto json = parseJSON(text);
+  const auto json = formats::parseJSON(text);
   if (!json)
     return Failure{fmt::format("not JSON: at byte {}: {}", json.error().offset, json.error().detail)};
   const Array* array = json.value().asArray();

@@ -25,7 +25,7 @@ sigset_t endingSignals() {
 
 void Interrupt::begin() {
   const sigset_t set = endingSignals();
-  _signals = platform::FileDescriptor(signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK));
+  _signals = FileDescriptor(signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK));
   // Without the descriptor the signals keep ending the process.
   if (_signals.get() >= 0) pthread_sigmask(SIG_BLOCK, &set, nullptr);
 }

@@ -5,7 +5,7 @@
 #include <chrono>
 #include <optional>
 
-#include "platform/file_descriptor.h"
+#include "base/file_descriptor.h"
 
 namespace veltrad::ctl {
 
@@ -21,7 +21,7 @@ class Interrupt {
   Wake wait(int descriptor, std::optional<std::chrono::milliseconds> time = std::nullopt);
 
  private:
-  platform::FileDescriptor _signals;
+  FileDescriptor _signals;
   bool _interrupted = false;
 };
 

@@ -3,8 +3,8 @@
 
 #include <fmt/format.h>
 
-#include "base/json.h"
 #include "base/text.h"
+#include "formats/json.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -18,7 +18,7 @@ Value valueOf(std::string_view text) {
   if (text == "false") return Value(false);
   if (text.empty() || !isDigit(text.back()) || !(isDigit(text.front()) || text.front() == '-'))
     return Value(text);
-  const auto number = parseJSON(text);
+  const auto number = formats::parseJSON(text);
   return number && number.value().isNumber() ? number.value() : Value(text);
 }
 

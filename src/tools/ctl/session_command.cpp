@@ -120,9 +120,9 @@ int runLines(SessionRun& run, LineReader& lines) {
 }  // namespace
 
 int runSession(const Options& options, Interrupt& interrupt) {
-  platform::FileDescriptor file;
+  FileDescriptor file;
   if (options.input) {
-    file = platform::FileDescriptor(open(options.input->c_str(), O_RDONLY | O_CLOEXEC));
+    file = FileDescriptor(open(options.input->c_str(), O_RDONLY | O_CLOEXEC));
     if (file.get() < 0) {
       complain(fmt::format("--input {}: {}", *options.input, std::strerror(errno)));
       return 2;

@@ -3,7 +3,7 @@
 
 #include <fmt/format.h>
 
-#include "base/json.h"
+#include "formats/json.h"
 #include "tools/ctl/given_values.h"
 
 namespace veltrad::ctl {
@@ -81,7 +81,7 @@ Result<SessionLine, std::string> parseSleep(const Dictionary& line) {
   const auto count = isInteger(*ms) ? ms->toInt64() : std::nullopt;
   if (!count) return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, typeName(*ms))};
   if (*count < 0 || *count > kLongestSleep.count()) {
-    return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, writeJSON(*ms))};
+    return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, formats::writeJSON(*ms))};
   }
   SessionLine result;
   result.operation = Operation::sleep;
@@ -97,7 +97,7 @@ Result<Operation, std::string> operationOf(const Dictionary& line) {
   for (Operation operation : kOperations) {
     if (*name == operationName(operation)) return operation;
   }
-  return Failure{fmt::format("unknown op {}: {}", writeJSON(*op), kExpectedOperations)};
+  return Failure{fmt::format("unknown op {}: {}", formats::writeJSON(*op), kExpectedOperations)};
 }
 
 }  // namespace
@@ -110,7 +110,7 @@ Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
   if (line.size() > kLongestLine) {
     return Failure{fmt::format("the line is too long: expected at most {} bytes", kLongestLine)};
   }
-  const auto json = parseJSON(line);
+  const auto json = formats::parseJSON(line);
   if (!json)
     return Failure{fmt::format("not JSON: at byte {}: {}", json.error().offset, json.error().detail)};
   const Dictionary* fields = json.value().asDictionary();

@@ -4,7 +4,7 @@
 #include <ctime>
 
 #include "base/base64.h"
-#include "base/property_list.h"
+#include "formats/property_list.h"
 
 namespace veltrad::lab {
 namespace {
@@ -20,7 +20,7 @@ std::optional<std::int64_t> fromHTTPDate(const std::string& text) {
 
 std::string bodyFor(const Dictionary& storebag, const SigningKey& key, Rule::Signature sign) {
   if (sign == Rule::Signature::right) return makeStorebagContainer(key, storebag);
-  const std::string bag = writeXMLPropertyList(storebag);
+  const std::string bag = formats::writeXMLPropertyList(storebag);
   if (sign == Rule::Signature::none) return bag;
   Dictionary container{{"bag", encodeBase64(bag)}};
   if (sign == Rule::Signature::wrong) {
@@ -28,7 +28,7 @@ std::string bodyFor(const Dictionary& storebag, const SigningKey& key, Rule::Sig
     signature.back() = static_cast<char>(signature.back() ^ 1);
     container.set("signature", encodeBase64(signature));
   }
-  return writeXMLPropertyList(container);
+  return formats::writeXMLPropertyList(container);
 }
 
 }  // namespace

@@ -29,8 +29,8 @@ double now() {
   return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
 }
 
-platform::FileDescriptor boundSocket(int port, int& boundPort) {
-  platform::FileDescriptor made(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+FileDescriptor boundSocket(int port, int& boundPort) {
+  FileDescriptor made(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   sockaddr_in address{};
   address.sin_family = AF_INET;
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);

@@ -10,8 +10,8 @@
 #include <string_view>
 #include <thread>
 
+#include "base/file_descriptor.h"
 #include "misbehaviour.h"
-#include "platform/file_descriptor.h"
 #include "received.h"
 
 namespace veltrad::lab {
@@ -55,9 +55,9 @@ class Dashboard {
   // Constant after start().
   Misbehaviour& _misbehaviour;
   Received& _lines;
-  platform::FileDescriptor _socket;
-  platform::FileDescriptor _stranger;  // a socket on another port
-  platform::FileDescriptor _stopping;  // an event descriptor
+  FileDescriptor _socket;
+  FileDescriptor _stranger;  // a socket on another port
+  FileDescriptor _stopping;  // an event descriptor
   int _port = 0;
   std::thread _thread;
 

@@ -6,9 +6,9 @@
 
 #include <algorithm>
 
-#include "base/json.h"
-#include "base/property_list.h"
 #include "certificate.h"
+#include "formats/json.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 
 namespace veltrad::lab {
@@ -74,11 +74,11 @@ bool isStorebagName(const std::string& name) {
 
 Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   if (json) {
-    auto value = parseJSON(bytes);
+    auto value = formats::parseJSON(bytes);
     if (value) return std::move(value).value();
     return Failure{"no JSON at byte " + std::to_string(value.error().offset) + ": " + value.error().detail};
   }
-  auto value = parsePropertyList(bytes);
+  auto value = formats::parsePropertyList(bytes);
   if (value) return std::move(value).value();
   return Failure{"no property list: " + value.error().detail};
 }

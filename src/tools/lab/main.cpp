@@ -6,8 +6,8 @@
 #include <csignal>
 #include <cstdio>
 
-#include "base/json.h"
 #include "directory.h"
+#include "formats/json.h"
 #include "server.h"
 
 namespace {
@@ -73,7 +73,7 @@ int serve(const Directory& directory, int port, int dashboardPort, int maxAge,
                                  {"certificate", directory.certificatePath()},
                                  {"publicKey", directory.publicKeyPath()},
                                  {"pid", static_cast<long>(getpid())}};
-  std::printf("%s\n", veltrad::writeJSON(line).c_str());
+  std::printf("%s\n", veltrad::formats::writeJSON(line).c_str());
   std::fflush(stdout);
   int signal = 0;
   sigwait(&signals, &signal);

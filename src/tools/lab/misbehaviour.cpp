@@ -3,7 +3,7 @@
 
 #include <algorithm>
 
-#include "base/json.h"
+#include "formats/json.h"
 
 namespace veltrad::lab {
 namespace {
@@ -111,7 +111,7 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
 }  // namespace
 
 Result<Rule, std::string> ruleFromJSON(std::string_view text) {
-  const auto parsed = parseJSON(text);
+  const auto parsed = formats::parseJSON(text);
   if (!parsed)
     return Failure{"no JSON at byte " + std::to_string(parsed.error().offset) + ": " + parsed.error().detail};
   const Dictionary* entries = parsed.value().asDictionary();

@@ -9,8 +9,8 @@
 #include <cstdio>
 #include <cstring>
 
-#include "base/json.h"
 #include "base/text.h"
+#include "formats/json.h"
 
 namespace veltrad::lab {
 namespace {
@@ -32,7 +32,7 @@ Received::~Received() {
 }
 
 void Received::add(const Dictionary& arrival, std::string_view body) {
-  std::string line = writeJSON(arrival);
+  std::string line = formats::writeJSON(arrival);
   if (!body.empty()) {
     line.pop_back();
     line.append(",\"body\":").append(body).push_back('}');
@@ -86,11 +86,11 @@ std::deque<std::string> Received::newest() const {
 
 std::string bodyAsJSON(const std::string& body) {
   if (body.empty()) return {};
-  if (const auto parsed = parseJSON(body)) {
+  if (const auto parsed = formats::parseJSON(body)) {
     // As it came, so that numbers keep their form.
-    return body.find_first_of("\r\n") == std::string::npos ? body : writeJSON(parsed.value());
+    return body.find_first_of("\r\n") == std::string::npos ? body : formats::writeJSON(parsed.value());
   }
-  return writeJSON(isUTF8(body) ? Value(body) : Value(Data{body}));
+  return formats::writeJSON(isUTF8(body) ? Value(body) : Value(Data{body}));
 }
 
 }  // namespace veltrad::lab

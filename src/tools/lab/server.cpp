@@ -7,10 +7,10 @@
 #include <charconv>
 #include <thread>
 
-#include "base/json.h"
-#include "base/property_list.h"
 #include "base/text.h"
 #include "connections.h"
+#include "formats/json.h"
+#include "formats/property_list.h"
 #include "page.h"
 #include "upload_digest.h"
 
@@ -231,9 +231,9 @@ void Server::Library::logData(const httplib::Request& request, httplib::Response
   line.set("bytes", std::uint64_t{body.size()});
   line.set("answer", toUTF8(answer.body));
   line.set("outcome", outcome(rule, answer));
-  const auto archive = parsePropertyList(body, kLogDataLimits);
+  const auto archive = formats::parsePropertyList(body, kLogDataLimits);
   if (!archive) line.set("problem", archive.error().detail);
-  lab._arrivals.logData.add(line, archive ? writeJSON(archive.value()) : bodyAsJSON(body));
+  lab._arrivals.logData.add(line, archive ? formats::writeJSON(archive.value()) : bodyAsJSON(body));
   send(request, response, answer, rule);
 }
 

@@ -10,10 +10,10 @@
 #include <cstring>
 #include <optional>
 
-#include "base/json.h"
-#include "base/property_list.h"
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
+#include "formats/json.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "storebag/lint.h"
 #include "storebag/signing.h"
@@ -60,17 +60,17 @@ bool startsLikeJSON(std::string_view bytes) {
 
 // Limits of both readers: the daemon's own are checked by sign().
 Result<Bag, std::string> readBag(const std::string& path) {
-  DiskFileStore files;
+  platform::DiskFileStore files;
   auto bytes = files.read(path, PropertyListLimits{}.bytes);
   if (!bytes) return Failure{bytes.error().description};
   if (startsLikeJSON(bytes.value())) {
-    auto json = parseJSON(bytes.value());
+    auto json = formats::parseJSON(bytes.value());
     if (!json)
       return Failure{fmt::format("{}: JSON, byte {}: {}", path, json.error().offset, json.error().detail)};
-    std::string list = writeXMLPropertyList(json.value());
+    std::string list = formats::writeXMLPropertyList(json.value());
     return Bag{std::move(json).value(), std::move(list)};
   }
-  auto list = parsePropertyList(bytes.value());
+  auto list = formats::parsePropertyList(bytes.value());
   if (!list) {
     if (list.error().kind == PropertyListError::Kind::notAPropertyList)
       return Failure{path + ": neither a property list nor JSON"};
@@ -80,8 +80,8 @@ Result<Bag, std::string> readBag(const std::string& path) {
 }
 
 std::string bounds() {
-  return fmt::format("at most {} bytes, {} levels and {} values", kStorebagBagLimits.bytes,
-                     kStorebagBagLimits.depth, kStorebagBagLimits.objects);
+  return fmt::format("at most {} bytes, {} levels and {} values", config::kStorebagBagLimits.bytes,
+                     config::kStorebagBagLimits.depth, config::kStorebagBagLimits.objects);
 }
 
 // The storebag in a container, unverified, or a bare one.
@@ -94,9 +94,9 @@ Result<Dictionary, std::string> readStorebag(const std::string& file) {
   // container's.
   const std::string* text = content->string("bag");
   if (text == nullptr) return *content;
-  const auto decoded = decodeStorebagContainer({std::string(), *text});
+  const auto decoded = config::decodeStorebagContainer({std::string(), *text});
   if (!decoded) return Failure{file + ": \"bag\" is no base64"};
-  const auto inner = parseStorebagBag(decoded->bag);
+  const auto inner = config::parseStorebagBag(decoded->bag);
   if (!inner)
     return Failure{fmt::format("{}: the bag is no property list of a dictionary within {}", file, bounds())};
   return *inner;
@@ -126,32 +126,33 @@ Outcome sign(const std::string& privateKey, const std::string& in, const std::st
   if (!bag) return refused(bag.error());
   if (bag.value().content.asDictionary() == nullptr)
     return refused(in + ": the storebag is no dictionary at its top level");
-  if (!parseStorebagBag(bag.value().bytes))
+  if (!config::parseStorebagBag(bag.value().bytes))
     return refused(fmt::format("{}: beyond what the daemon takes of a storebag: {}", in, bounds()));
   const std::string container = makeStorebagContainerAround(key.value(), bag.value().bytes);
-  if (!parseStorebagContainer(container))
+  if (!config::parseStorebagContainer(container))
     return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", in, container.size(),
-                               kStorebagMostContainerBytes));
-  DiskFileStore files;
+                               config::kStorebagMostContainerBytes));
+  platform::DiskFileStore files;
   if (const auto failure = files.replace(out, container, 0644)) return refused(failure->description);
   return done("");
 }
 
 Outcome verify(const std::string& publicKey, const std::string& file) {
-  DiskFileStore files;
-  const auto der = files.read(publicKey, kStorebagMostContainerBytes);
+  platform::DiskFileStore files;
+  const auto der = files.read(publicKey, config::kStorebagMostContainerBytes);
   if (!der) return refused(der.error().description);
-  const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
+  const std::optional<config::StorebagKey> key = config::StorebagKey::fromDER(der.value());
   if (!key)
     return refused(fmt::format("{}: expected an RSA public key in DER form of {} to {} bits", publicKey,
-                               StorebagKey::kFewestModulusBits, StorebagKey::kMostModulusBits));
-  const auto bytes = files.read(file, kStorebagMostContainerBytes);
+                               config::StorebagKey::kFewestModulusBits,
+                               config::StorebagKey::kMostModulusBits));
+  const auto bytes = files.read(file, config::kStorebagMostContainerBytes);
   if (!bytes) return refused(bytes.error().description);
-  const auto container = parseStorebagContainer(bytes.value());
+  const auto container = config::parseStorebagContainer(bytes.value());
   if (!container) return refused(file + ": the container is no property list: " + container.error().detail);
   if (!container.value().signature) return refused(file + ": the text \"signature\" is missing");
   if (!container.value().bag) return refused(file + ": the text \"bag\" is missing");
-  const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
+  const std::optional<config::SignedStorebag> decoded = config::decodeStorebagContainer(container.value());
   if (!decoded) return refused(file + ": \"signature\" or \"bag\" is no base64");
   const std::size_t expected = static_cast<std::size_t>(key->modulusBits() + 7) / 8;
   if (decoded->signature.size() != expected)
@@ -159,7 +160,7 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
                                decoded->signature.size(), expected));
   if (!key->verifies(decoded->bag, decoded->signature))
     return refused(file + ": the signature is not this key's over this bag");
-  if (!parseStorebagBag(decoded->bag))
+  if (!config::parseStorebagBag(decoded->bag))
     return refused(
         fmt::format("{}: signed, but the bag is no property list of a dictionary within {}", file, bounds()));
   return done(file + ": the signature holds\n");
@@ -168,7 +169,8 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
 Outcome show(const std::string& file, bool compact) {
   const auto storebag = readStorebag(file);
   if (!storebag) return refused(storebag.error());
-  std::string json = writeJSON(storebag.value(), compact ? JSONStyle::compact : JSONStyle::pretty);
+  std::string json = formats::writeJSON(storebag.value(),
+                                        compact ? formats::JSONStyle::compact : formats::JSONStyle::pretty);
   if (!json.ends_with('\n')) json += '\n';
   return done(std::move(json));
 }

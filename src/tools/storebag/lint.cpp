@@ -6,10 +6,10 @@
 #include <algorithm>
 #include <initializer_list>
 
-#include "base/json.h"
 #include "base/text.h"
 #include "config/client_types.h"
-#include "protocol/constants.h"
+#include "formats/json.h"
+#include "wire/constants.h"
 
 namespace veltrad {
 namespace {
@@ -26,9 +26,9 @@ constexpr Keys kStorebagKeys = {{"development", Kind::dictionary}, {"florn_inter
                                 {"seed", Kind::dictionary},        {"release", Kind::dictionary},
                                 {"version", Kind::text},           {"refresh_cycle", Kind::number}};
 constexpr Keys kBackends = {
-    {kVeltraBackendDashboard, Kind::dictionary}, {kVeltraBackendUploadServer, Kind::dictionary},
-    {kVeltraBackendHTTPPost, Kind::dictionary},  {kVeltraBackendHTTPPost2, Kind::dictionary},
-    {kVeltraBackendAmpery, Kind::dictionary},    {kVeltraBackendMivo, Kind::dictionary}};
+    {wire::kVeltraBackendDashboard, Kind::dictionary}, {wire::kVeltraBackendUploadServer, Kind::dictionary},
+    {wire::kVeltraBackendHTTPPost, Kind::dictionary},  {wire::kVeltraBackendHTTPPost2, Kind::dictionary},
+    {wire::kVeltraBackendAmpery, Kind::dictionary},    {wire::kVeltraBackendMivo, Kind::dictionary}};
 constexpr Keys kHTTPSPostKeys = {{"clients", Kind::array}, {"display_url", Kind::text}};
 constexpr Keys kUploadKeys = {{"post_url", Kind::text}, {"display_url", Kind::text}};
 constexpr Keys kEntryKeys = {{"client", Kind::text},
@@ -95,7 +95,7 @@ bool holdsText(const Array* array) {
 }
 
 std::string quoted(const std::string& text) {
-  return writeJSON(Value(text));
+  return formats::writeJSON(Value(text));
 }
 
 // Says what it finds in the order of its calls.
@@ -107,7 +107,7 @@ class Lint {
     if (!storebag.contains("release"))
       say("storebag",
           "no \"release\": most devices get nothing, and those of \"seed\" have nothing to fall back on");
-    for (std::uint32_t environment = 1; const char* name = sectionNameForEnvironment(environment);
+    for (std::uint32_t environment = 1; const char* name = config::sectionNameForEnvironment(environment);
          ++environment)
       if (const Dictionary* section = storebag.dictionary(name)) checkSection(name, *section);
   }
@@ -130,7 +130,7 @@ class Lint {
       } else if (key->kind == Kind::texts) {
         for (const Value& item : *value.asArray())
           if (!item.asString())
-            say(place, fmt::format("{} holds {}, which is no text", quoted(name), writeJSON(item)));
+            say(place, fmt::format("{} holds {}, which is no text", quoted(name), formats::writeJSON(item)));
       }
     }
   }
@@ -149,10 +149,10 @@ class Lint {
 
   void checkSection(const std::string& place, const Dictionary& section) {
     checkKeys(place, "back end", section, kBackends);
-    for (const char* name : {kVeltraBackendHTTPPost, kVeltraBackendHTTPPost2})
+    for (const char* name : {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2})
       if (const Dictionary* profile = section.dictionary(name)) checkClients(place + "." + name, *profile);
-    if (const Dictionary* profile = section.dictionary(kVeltraBackendUploadServer))
-      checkUploads(place + "." + kVeltraBackendUploadServer, *profile);
+    if (const Dictionary* profile = section.dictionary(wire::kVeltraBackendUploadServer))
+      checkUploads(place + "." + wire::kVeltraBackendUploadServer, *profile);
   }
 
   void checkUploads(const std::string& place, const Dictionary& profile) {

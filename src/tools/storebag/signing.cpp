@@ -11,7 +11,7 @@
 #include <cstdlib>
 
 #include "base/base64.h"
-#include "base/property_list.h"
+#include "formats/property_list.h"
 #include "platform/file_store.h"
 
 namespace veltrad {
@@ -94,11 +94,11 @@ std::string SigningKey::sign(std::string_view bag) const {
 }
 
 std::string makeStorebagContainer(const SigningKey& key, const Dictionary& storebag) {
-  return makeStorebagContainerAround(key, writeXMLPropertyList(storebag));
+  return makeStorebagContainerAround(key, formats::writeXMLPropertyList(storebag));
 }
 
 std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag) {
-  return writeXMLPropertyList(
+  return formats::writeXMLPropertyList(
       Dictionary{{"signature", encodeBase64(key.sign(bag))}, {"bag", encodeBase64(bag)}});
 }
 

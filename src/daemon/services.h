@@ -1,0 +1,57 @@
+// The real services, built once by a program's main and handed on by reference, a few to each room.
+#pragma once
+
+#include "backends/ampery/energy_log.h"
+#include "backends/dashboard/work_pool.h"
+#include "backends/mivo/code_bundle.h"
+#include "http/http_client.h"
+#include "ipc/entitlements.h"
+#include "platform/clock.h"
+#include "platform/counters.h"
+#include "platform/device_properties.h"
+#include "platform/disk_writer.h"
+#include "platform/file_store.h"
+#include "platform/lent_files.h"
+#include "platform/locale.h"
+#include "platform/memory_budget.h"
+#include "platform/preferences.h"
+#include "platform/random.h"
+#include "platform/root.h"
+#include "platform/service_manager.h"
+#include "platform/transaction.h"
+
+namespace veltrad::daemon {
+
+struct Services {
+  explicit Services(platform::Root where)
+      : root(std::move(where)),
+        preferences(files, root.preferencesDirectory()),
+        device(files, root.devicePath()),
+        locale(files, root.localeConfigurationPath()),
+        entitlements(files, root.entitlementsPath()),
+        transaction(serviceManager),
+        energyLog(clock, counters, root.energyLogPath()),
+        adaptorBundle(root.adaptorBundleDirectory(), "PellmarchPerformance"),
+        http({root.extraCertificatesPath()}) {}
+
+  const platform::Root root;
+  platform::MemoryBudget memory;
+  platform::SystemClock clock;
+  platform::UnseededSequence random;
+  platform::DiskFileStore files;
+  platform::FilePreferences preferences;
+  platform::MachineProperties device;
+  platform::EnvironmentLocale locale;
+  ipc::Entitlements entitlements;
+  platform::ServiceManager serviceManager;
+  platform::ServiceTransaction transaction;
+  platform::Counters counters;
+  backends::EnergyLog energyLog;
+  backends::CodeBundle adaptorBundle;
+  http::CurlHTTPClient http;
+  backends::WorkPool pool;
+  platform::LentFiles lentFiles;
+  platform::DiskWriter writer;
+};
+
+}  // namespace veltrad::daemon

@@ -1,0 +1,11 @@
+// Tells the two forms of property lists apart.
+#include "formats/property_list.h"
+
+namespace veltrad::formats {
+
+Result<Value, PropertyListError> parsePropertyList(std::string_view bytes, const PropertyListLimits& limits) {
+  return bytes.starts_with("bplist") ? parseBinaryPropertyList(bytes, limits)
+                                     : parseXMLPropertyList(bytes, limits);
+}
+
+}  // namespace veltrad::formats

@@ -1,0 +1,355 @@
+// The rules for libcurl: what is switched off, what is bounded, what is verified. HTTP thread.
+#include "http/curl_transfer.h"
+
+#include <openssl/ssl.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cctype>
+#include <cerrno>
+#include <cstring>
+#include <new>
+#include <utility>
+
+#include "base/text.h"
+
+namespace veltrad::http {
+
+namespace {
+
+constexpr std::string_view kNoResolverThread = "getaddrinfo() thread failed to start";  // libcurl's text
+constexpr long kConnectSeconds = 10;
+constexpr long kLowSpeedSeconds = 60;
+constexpr std::size_t kMostHeaderBytes = 64u << 10;
+constexpr std::size_t kMostHeaderLines = 256;  // libcurl's own work on them grows with the square
+
+bool isControl(char c) {
+  return static_cast<unsigned char>(c) < 0x20 || c == 0x7f;
+}
+
+std::string_view trimmed(std::string_view text) {
+  const auto blank = [](char c) { return c == ' ' || isControl(c); };
+  while (!text.empty() && blank(text.front())) text.remove_prefix(1);
+  while (!text.empty() && blank(text.back())) text.remove_suffix(1);
+  return text;
+}
+
+// A token of RFC 9110, 5.6.2.
+bool isToken(std::string_view name) {
+  const auto allowed = [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return byte < 0x80 &&
+           (std::isalnum(byte) != 0 || std::string_view("!#$%&'*+-.^_`|~").find(c) != std::string_view::npos);
+  };
+  return !name.empty() && std::all_of(name.begin(), name.end(), allowed);
+}
+
+// "name: value" for libcurl, in whose notation an empty value is "name;".
+std::string headerLine(std::string_view name, std::string_view value) {
+  std::string clean(value);
+  clean.erase(std::remove_if(clean.begin(), clean.end(), isControl), clean.end());
+  clean.erase(0, clean.find_first_not_of(' '));
+  std::string line(name);
+  return clean.empty() ? line + ";" : line + ": " + clean;
+}
+
+// What stands between "//" and the path.
+std::string hostOf(std::string_view url) {
+  const std::size_t slashes = url.find("//");
+  if (slashes != std::string_view::npos) url.remove_prefix(slashes + 2);
+  return std::string(url.substr(0, url.find_first_of("/?#")));
+}
+
+CURLcode setStore(CURL*, void* context, void* trust) {
+  try {
+    X509_STORE* store = static_cast<TrustStore*>(trust)->current();
+    if (store == nullptr) return CURLE_OUT_OF_MEMORY;
+    SSL_CTX_set1_cert_store(static_cast<SSL_CTX*>(context), store);
+    return CURLE_OK;
+  } catch (const std::bad_alloc&) {
+    return CURLE_OUT_OF_MEMORY;
+  }
+}
+
+bool isShortage(int error) {
+  return error == EMFILE || error == ENFILE || error == ENOMEM || error == ENOBUFS;
+}
+
+// Whether there are as many descriptors as libc and OpenSSL open while they resolve a name or look for a
+// certificate: neither says that it was this which it lacked.
+bool descriptorsAreShort() {
+  std::array<FileDescriptor, 4> some;
+  return std::any_of(some.begin(), some.end(), [](FileDescriptor& one) {
+    one.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+    return !one.isOpen() && isShortage(errno);
+  });
+}
+
+}  // namespace
+
+// curl_easy_setopt, and whether all of it was taken: an option that is missing may be one that protects.
+class CurlTransfer::Options {
+ public:
+  explicit Options(CURL* easy) : _easy(easy) {}
+  template <typename Value>
+  void set(CURLoption option, Value value) {
+    _taken = _taken && curl_easy_setopt(_easy, option, value) == CURLE_OK;
+  }
+  bool taken() const { return _taken; }
+
+ private:
+  CURL* const _easy;
+  bool _taken = true;
+};
+
+CurlTransfer::CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool blocking, Time now)
+    : _request(std::move(request)),
+      _completion(std::move(completion)),
+      _blocking(blocking),
+      _host(hostOf(_request.url)),
+      _bodySize(_request.fileBody ? _request.fileBody->bytes : _request.body.size()),
+      _arrived(now) {
+  const bool waitsForItsLane =
+      _request.lane == HTTPRequest::Lane::upload || _request.lane == HTTPRequest::Lane::logData;
+  if (!waitsForItsLane && _request.leastBytesPerSecond == 0) _deadline = now + _request.timeout;
+}
+
+bool CurlTransfer::attach(CURL* easy, TrustStore& trust, KeptConnections& connections, Time now) {
+  Options options(easy);
+  _connections = &connections;
+  options.set(CURLOPT_URL, _request.url.c_str());
+  options.set(CURLOPT_PROTOCOLS_STR, "https");
+  options.set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
+  options.set(CURLOPT_FOLLOWLOCATION, 0L);
+  options.set(CURLOPT_NETRC, static_cast<long>(CURL_NETRC_IGNORED));
+  options.set(CURLOPT_PROXY, "");  // nor one from the environment
+  options.set(CURLOPT_NOSIGNAL, 1L);
+  options.set(CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
+  options.set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
+  options.set(CURLOPT_OPENSOCKETDATA, this);
+  options.set(CURLOPT_CLOSESOCKETFUNCTION, KeptConnections::close);
+  options.set(CURLOPT_CLOSESOCKETDATA, _connections);
+  options.set(CURLOPT_FRESH_CONNECT, metEndedConnection() ? 1L : 0L);
+  _connection = Connection::kept;
+  _error[0] = '\0';
+  options.set(CURLOPT_ERRORBUFFER, _error.data());
+  options.set(CURLOPT_PREREQFUNCTION, beforeRequest);
+  options.set(CURLOPT_PREREQDATA, this);
+  options.set(CURLOPT_WRITEFUNCTION, takeBody);
+  options.set(CURLOPT_WRITEDATA, this);
+  options.set(CURLOPT_HEADERFUNCTION, takeHeader);
+  options.set(CURLOPT_HEADERDATA, this);
+  setBody(options);
+  setLimits(options, now);
+  options.set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
+  options.set(CURLOPT_SSL_VERIFYPEER, 1L);
+  options.set(CURLOPT_SSL_VERIFYHOST, 2L);
+  options.set(CURLOPT_SSL_SESSIONID_CACHE, 0L);  // every connection has its certificate checked
+  // The shared store alone: libcurl would load its own for each connection, and its cache would keep ours
+  // when it has been replaced.
+  options.set(CURLOPT_CA_CACHE_TIMEOUT, 0L);
+  options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
+  options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
+  options.set(CURLOPT_SSL_CTX_FUNCTION, setStore);
+  options.set(CURLOPT_SSL_CTX_DATA, &trust);
+  return options.taken() && setHeaders(easy);
+}
+
+bool CurlTransfer::setHeaders(CURL* easy) {
+  _headerList.reset();
+  // What libcurl would add by itself, unless the request has its own.
+  std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
+  bool lengthSaid = false;  // in its place among the others; what the request says of it does not count
+  const auto append = [this](const std::string& line) {
+    curl_slist* longer = curl_slist_append(_headerList.get(), line.c_str());
+    if (longer == nullptr) return false;
+    (void)_headerList.release();
+    _headerList.reset(longer);
+    return true;
+  };
+  for (const auto& [name, value] : _request.headers) {
+    const std::string_view given = name;
+    const auto is = [given](const char* other) { return equalIgnoringCase(given, other); };
+    if (!isToken(given) || is("Transfer-Encoding") || is("Expect")) continue;
+    for (auto& [automatic, found] : own) found = found || is(automatic);
+    if (is("Content-Length")) {
+      if (std::exchange(lengthSaid, true)) continue;
+      if (!append(headerLine("Content-Length", std::to_string(_bodySize)))) return false;
+    } else if (!append(headerLine(name, value))) {
+      return false;
+    }
+  }
+  for (const auto& [automatic, found] : own) {
+    if (!found && !append(std::string(automatic) + ":")) return false;
+  }
+  return append("Expect:") && curl_easy_setopt(easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
+}
+
+void CurlTransfer::setBody(Options& options) {
+  if (_request.method == HTTPRequest::Method::get) return options.set(CURLOPT_HTTPGET, 1L);
+  options.set(CURLOPT_POST, 1L);
+  options.set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_bodySize));
+  if (!_request.fileBody) return options.set(CURLOPT_POSTFIELDS, _request.body.data());  // not copied
+  // Without a function to seek in it: it is not sent twice.
+  _sent = 0;
+  options.set(CURLOPT_READFUNCTION, giveBody);
+  options.set(CURLOPT_READDATA, this);
+}
+
+std::size_t CurlTransfer::giveBody(char* bytes, std::size_t size, std::size_t count, void* self) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  const auto most = std::min<std::uint64_t>(size * count, transfer._bodySize - transfer._sent);
+  if (most == 0) return 0;
+  ssize_t length = 0;
+  do {
+    length = pread(transfer._request.fileBody->file->get(), bytes, most, static_cast<off_t>(transfer._sent));
+  } while (length < 0 && errno == EINTR);
+  if (length <= 0) {
+    transfer._bodyError = length == 0 ? ENODATA : errno;
+    return CURL_READFUNC_ABORT;
+  }
+  transfer._sent += static_cast<std::uint64_t>(length);
+  return static_cast<std::size_t>(length);
+}
+
+curl_socket_t CurlTransfer::openSocket(void* self, curlsocktype, curl_sockaddr* address) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  transfer._connection = Connection::own;
+  const curl_socket_t made = transfer._connections->open(*address);
+  transfer._socketError = made == CURL_SOCKET_BAD && isShortage(errno) ? errno : 0;
+  return made;
+}
+
+// Not on a kept connection that has ended. And not again: libcurl repeats a request when a kept connection
+// ends without a byte; the server may have read it all the same, and a post is never sent twice.
+int CurlTransfer::beforeRequest(void* self, char*, char*, int, int localPort) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  if (transfer._attempts > 0 && transfer._request.method == HTTPRequest::Method::post)
+    return CURL_PREREQFUNC_ABORT;
+  if (transfer._connection == Connection::kept && transfer._connections->ended(localPort)) {
+    transfer._connection = Connection::ended;
+    return CURL_PREREQFUNC_ABORT;
+  }
+  ++transfer._attempts;
+  return CURL_PREREQFUNC_OK;
+}
+
+void CurlTransfer::setLimits(Options& options, Time now) {
+  options.set(CURLOPT_CONNECTTIMEOUT, kConnectSeconds);
+  if (_request.leastBytesPerSecond != 0) {
+    options.set(CURLOPT_LOW_SPEED_LIMIT, static_cast<long>(_request.leastBytesPerSecond));
+    options.set(CURLOPT_LOW_SPEED_TIME, kLowSpeedSeconds);
+    return;
+  }
+  if (!_deadline) _deadline = now + _request.timeout;
+  const auto left = std::chrono::ceil<std::chrono::milliseconds>(*_deadline - now).count();
+  options.set(CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would be no limit at all
+}
+
+std::size_t CurlTransfer::takeBody(char* bytes, std::size_t size, std::size_t count, void* self) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  const std::size_t length = size * count;
+  transfer._received += length;  // far below overflow: libcurl hands over some hundred KiB at most
+  if (transfer.answerTooLarge()) return CURL_WRITEFUNC_ERROR;
+  if (!transfer._request.keepsAnswer) return length;
+  try {
+    transfer._body.append(bytes, length);
+    return length;
+  } catch (const std::bad_alloc&) {
+    transfer._memoryShort = true;
+    return CURL_WRITEFUNC_ERROR;
+  }
+}
+
+// Line by line, those of interim answers and trailers too.
+std::size_t CurlTransfer::takeHeader(char* bytes, std::size_t size, std::size_t count, void* self) {
+  auto& transfer = *static_cast<CurlTransfer*>(self);
+  const std::size_t length = size * count;
+  transfer._headerBytes += length;
+  if (transfer._headerBytes > kMostHeaderBytes || ++transfer._headerLines > kMostHeaderLines)
+    return CURL_WRITEFUNC_ERROR;
+  if (!transfer._request.keepsAnswer) return length;
+  try {
+    transfer.collectHeader({bytes, length});
+    return length;
+  } catch (const std::bad_alloc&) {
+    transfer._memoryShort = true;
+    return CURL_WRITEFUNC_ERROR;
+  }
+}
+
+void CurlTransfer::collectHeader(std::string_view line) {
+  const bool continues = line.front() == ' ' || line.front() == '\t';
+  line = trimmed(line);
+  if (_headersEnded && line.starts_with("HTTP/")) {  // else a trailer, which nobody reads
+    _headersEnded = false;
+    _headers.clear();
+  } else if (line.empty() && !continues) {
+    _headersEnded = true;
+  } else if (!_headersEnded && continues && !_headers.empty()) {
+    _headers.back().second.append(" ").append(line);
+  } else if (const std::size_t colon = line.find(':'); !_headersEnded && colon != std::string_view::npos) {
+    _headers.emplace_back(trimmed(line.substr(0, colon)), trimmed(line.substr(colon + 1)));
+  }
+}
+
+HTTPResult CurlTransfer::result(CURLcode code, CURL* easy) {
+  long status = 0;
+  curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+  const bool statusCounts = code == CURLE_OK || (answerTooLarge() && !_request.keepsAnswer);
+  if (statusCounts) return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body)};
+  HTTPError error{kindOf(code), {}, static_cast<int>(status)};
+  try {
+    error.description = describe(code);
+  } catch (const std::bad_alloc&) {
+    error.description = outOfMemory().description;
+  }
+  return Failure{std::move(error)};
+}
+
+HTTPError::Kind CurlTransfer::kindOf(CURLcode code) const {
+  using Kind = HTTPError::Kind;
+  if (answerTooLarge()) return Kind::tooLarge;
+  if (_attempts > 0) return Kind::transport;
+  if (_socketError != 0 || code == CURLE_OUT_OF_MEMORY) return Kind::shortage;
+  if (code == CURLE_COULDNT_RESOLVE_HOST && std::string_view(_error.data()).starts_with(kNoResolverThread))
+    return Kind::shortage;
+  const bool neededFiles = code == CURLE_COULDNT_RESOLVE_HOST || code == CURLE_PEER_FAILED_VERIFICATION;
+  return neededFiles && descriptorsAreShort() ? Kind::shortage : Kind::transport;
+}
+
+std::string CurlTransfer::describe(CURLcode code) const {
+  if (_memoryShort) return outOfMemory().description;
+  if (_headerBytes > kMostHeaderBytes || _headerLines > kMostHeaderLines)
+    return "The answer's headers are over " + std::to_string(kMostHeaderBytes) + " bytes or " +
+           std::to_string(kMostHeaderLines) + " lines";
+  if (answerTooLarge())
+    return "The answer is larger than " + std::to_string(_request.mostResponseBytes) + " bytes";
+  if (_bodyError != 0)
+    return std::string("The file to send cannot be read as far as it should: ") + strerrordesc_np(_bodyError);
+  if (_socketError != 0) return std::string("No socket can be opened: ") + strerrordesc_np(_socketError);
+  if (code == CURLE_ABORTED_BY_CALLBACK)
+    return "Empty reply from server";  // as libcurl says on a new connection
+  std::string text = _error[0] != '\0' ? _error.data() : curl_easy_strerror(code);
+  while (!text.empty() && isControl(text.back())) text.pop_back();
+  std::replace_if(text.begin(), text.end(), isControl, ' ');
+  return text;
+}
+
+HTTPResult CurlTransfer::timedOutWaiting() const {
+  try {
+    return Failure{HTTPError{HTTPError::Kind::transport,
+                             "Timed out after " + std::to_string(_request.timeout.count()) +
+                                 " milliseconds while waiting for a connection to " + _host}};
+  } catch (const std::bad_alloc&) {
+    return Failure{outOfMemory()};
+  }
+}
+
+void CurlTransfer::complete(HTTPResult result) {
+  const HTTPCompletion completion = std::exchange(_completion, nullptr);
+  if (completion) completion(std::move(result));
+}
+
+}  // namespace veltrad::http

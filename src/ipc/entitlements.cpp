@@ -1,0 +1,183 @@
+// The rules of who may do what. Any thread; the file is reread when it changed.
+#include "ipc/entitlements.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "formats/property_list.h"
+#include "platform/file_store.h"
+#include "platform/log.h"
+
+namespace veltrad::ipc {
+
+namespace {
+
+// An id exactly: no boolean, no real, nothing that would have to be wrapped.
+std::optional<unsigned> idOf(const Value& value) {
+  if (value.type() != Value::Type::signedInteger && value.type() != Value::Type::unsignedInteger)
+    return std::nullopt;
+  const auto number = value.toInt64();
+  if (!number || *number < 0 || *number >= 0xffff'ffff) return std::nullopt;
+  return static_cast<unsigned>(*number);
+}
+
+// A condition of the wrong type is never met: read as absent, it would make the rule wider.
+bool matches(const Dictionary& rule, const Peer& peer) {
+  const Value* uid = rule.find("uid");
+  const Value* gid = rule.find("gid");
+  const Value* unit = rule.find("unit");
+  if (!uid && !gid && !unit) return false;
+  if (uid && idOf(*uid) != peer.uid) return false;
+  if (gid) {
+    const auto wanted = idOf(*gid);
+    if (!wanted || std::find(peer.gids.begin(), peer.gids.end(), *wanted) == peer.gids.end()) return false;
+  }
+  if (unit) {
+    const std::string* wanted = unit->asString();
+    if (!wanted || !peer.unit || *wanted != *peer.unit) return false;
+  }
+  return true;
+}
+
+// Why the rule can never grant anything; nothing when it can.
+std::optional<std::string> problemOf(const Value& value) {
+  const Dictionary* rule = value.asDictionary();
+  if (!rule) return "expected a dictionary";
+  const Value* uid = rule->find("uid");
+  const Value* gid = rule->find("gid");
+  const Value* unit = rule->find("unit");
+  if (!uid && !gid && !unit) return "expected \"uid\", \"gid\" or \"unit\"";
+  if (uid && !idOf(*uid)) return "\"uid\" is no user id, expected an integer";
+  if (gid && !idOf(*gid)) return "\"gid\" is no group id, expected an integer";
+  if (unit && !unit->asString()) return "\"unit\" is no text, expected a unit's name";
+  if (!rule->dictionary("entitlements")) return "expected a dictionary under \"entitlements\"";
+  return std::nullopt;
+}
+
+struct ReadRules {
+  Array rules;
+  std::optional<std::string> shortage;
+  std::optional<std::string> error;
+  std::vector<std::string> warnings;
+};
+
+ReadRules readRules(platform::FileStore& files, const std::string& path) {
+  ReadRules read;
+  const auto bytes = files.read(path);
+  if (!bytes) {
+    const platform::FileFailure& failure = bytes.error();
+    if (failure.passes()) {
+      read.shortage = failure.description;
+    } else if (failure.kind != platform::FileFailure::Kind::notFound) {
+      read.error = failure.description;
+    }
+    return read;
+  }
+  const auto list = formats::parsePropertyList(bytes.value());
+  const Array* rules = list ? list.value().asArray() : nullptr;
+  if (!rules) {
+    read.error = path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
+    return read;
+  }
+  read.rules = *rules;
+  bool namesUnits = false;
+  for (std::size_t i = 0; i < rules->size(); ++i) {
+    const Value& rule = (*rules)[i];
+    if (const auto problem = problemOf(rule)) {
+      read.warnings.push_back(path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
+    } else {
+      namesUnits = namesUnits || rule.asDictionary()->contains("unit");
+    }
+  }
+  if (namesUnits && !kernelTellsUnits()) {
+    read.warnings.push_back(path +
+                            ": rules with \"unit\" never match, this kernel does not tell a peer's process");
+  }
+  return read;
+}
+
+}  // namespace
+
+std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer) {
+  for (const Value& value : rules) {
+    const Dictionary* rule = value.asDictionary();
+    if (!rule || !matches(*rule, peer)) continue;
+    const Dictionary* entitlements = rule->dictionary("entitlements");
+    if (const Value* found = entitlements ? entitlements->find(name) : nullptr) return *found;
+  }
+  return std::nullopt;
+}
+
+bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
+  return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
+    const Dictionary* rule = value.asDictionary();
+    const Value* wanted = rule ? rule->find("uid") : nullptr;
+    if (!rule || (wanted && idOf(*wanted) != uid)) return false;
+    const Dictionary* entitlements = rule->dictionary("entitlements");
+    return entitlements && entitlements->contains(name);
+  });
+}
+
+Entitlements::Entitlements(platform::FileStore& files, std::string path)
+    : _files(files), _path(std::move(path)) {}
+
+// Logged once the lock is released.
+struct Entitlements::Said {
+  std::optional<std::string> error;
+  std::optional<std::string> shortage;
+  std::vector<std::string> warnings;
+};
+
+void Entitlements::refresh(Said& said) {
+  // The stamp comes first: a file that changes while it is read is read again.
+  const auto stamp = _files.stamp(_path);
+  if (!stamp) {
+    said.shortage = stamp.error().description;
+    return;
+  }
+  if (_read && stamp.value() == _stamp) return;
+  ReadRules fresh = readRules(_files, _path);
+  said.shortage = std::move(fresh.shortage);
+  if (said.shortage) return;
+  _rules = std::move(fresh.rules);
+  said.error = std::move(fresh.error);
+  said.warnings = std::move(fresh.warnings);
+  _stamp = stamp.value();
+  _read = true;
+}
+
+std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {
+  Said said;
+  std::optional<Value> found;
+  {
+    Lock lock(_mutex);
+    refresh(said);
+    found = entitlementInRules(_rules, name, peer);
+  }
+  say(said);
+  return found;
+}
+
+bool Entitlements::mayHold(std::string_view name, unsigned uid) {
+  Said said;
+  bool may = false;
+  {
+    Lock lock(_mutex);
+    refresh(said);
+    may = mayHoldByRules(_rules, name, uid);
+  }
+  say(said);
+  return may;
+}
+
+void Entitlements::say(const Said& said) {
+  if (said.error) logError("Entitlements could not be read, nothing is granted: %s", said.error->c_str());
+  for (const std::string& warning : said.warnings) logWarning("Entitlements: %s", warning.c_str());
+  if (said.shortage) {
+    const auto line = _shortages.happened("Entitlements could not be read just now, the last rules stand: " +
+                                          *said.shortage);
+    if (line) logWarning("%s", line->c_str());
+  }
+}
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,50 @@
+// Who may do what: etc/veltrad/entitlements.plist, reread when it changed. Any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "base/mutex.h"
+#include "base/value.h"
+#include "ipc/peer.h"
+#include "platform/limited_line.h"
+
+namespace veltrad::platform {
+class FileStore;
+}  // namespace veltrad::platform
+
+namespace veltrad::ipc {
+
+// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
+// rule with more than one of the three matches when all of them match, one with none never. A missing or
+// unreadable file grants nothing; an unreadable or malformed one is one error line a change. For a shortage
+// the last rules stand, and the file is read again at the next question.
+class Entitlements {
+ public:
+  Entitlements(platform::FileStore& files, std::string path);
+  // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
+  std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
+  // False: no rule grants it to this user, whatever groups and unit a process of his has.
+  bool mayHold(std::string_view name, unsigned uid);
+
+ private:
+  struct Said;
+  void refresh(Said& said) REQUIRES(_mutex);
+  void say(const Said& said);
+
+  platform::FileStore& _files;
+  const std::string _path;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
+  bool _read GUARDED_BY(_mutex) = false;
+  Array _rules GUARDED_BY(_mutex);
+  platform::LimitedLine _shortages{"questions"};
+};
+
+// The decisions alone; exposed for their tables of tests.
+bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid);
+std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
+
+}  // namespace veltrad::ipc

@@ -1,0 +1,24 @@
+// Where the daemon listens.
+#include "wire/socket_path.h"
+
+#include <cstdlib>
+
+namespace veltrad::wire {
+
+std::string rootFromEnvironment() {
+  const char* directory = std::getenv("VELTRA_ROOT");
+  return directory && *directory ? directory : "/";
+}
+
+std::string pathUnder(std::string root, std::string_view relative) {
+  while (!root.empty() && root.back() == '/') root.pop_back();
+  root += '/';
+  root += relative;
+  return root;
+}
+
+std::string socketPathUnder(std::string root) {
+  return pathUnder(std::move(root), "run/veltrad/com.florn.veltrad.sock");
+}
+
+}  // namespace veltrad::wire

@@ -1,0 +1,15 @@
+// Where the daemon listens: a path under the system's root directory, known to both ends of the socket.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace veltrad::wire {
+
+// VELTRA_ROOT, or "/" where it is unset or empty.
+std::string rootFromEnvironment();
+// `relative` without a leading slash: pathUnder("/", "etc/veltrad/ca.pem").
+std::string pathUnder(std::string root, std::string_view relative);
+std::string socketPathUnder(std::string root);
+
+}  // namespace veltrad::wire

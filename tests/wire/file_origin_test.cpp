@@ -1,0 +1,48 @@
+// Whose reads end by the kernel's word: real mounts are for tests/e2e/test_uploads.py, which can make them.
+#include "wire/file_origin.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "base/file_descriptor.h"
+
+namespace veltrad::platform {
+namespace {
+
+TEST(FileOrigin, TypesOfMountsAndTheirVerdicts) {
+  constexpr std::string_view kMounts =
+      "27 1 254:0 / / rw,relatime shared:1 - ext4 /dev/vda rw\n"
+      "42 27 0:39 / /mnt/a\\040-\\040b rw,nosuid - fuse.sshfs me@there:/ rw,user_id=1000\n"
+      "142 27 0:40 / /run rw master:2 propagate_from:1 - tmpfs tmpfs rw\n"
+      "9 27 0:41 / /cut";
+  using Kind = wire::FileOrigin::Kind;
+  const std::tuple<const char*, const char*, Kind> cases[] = {
+      {"27", "ext4", Kind::local},   {"42", "fuse.sshfs", Kind::foreign},
+      {"142", "tmpfs", Kind::local}, {"9", "", Kind::foreign},
+      {"2", "", Kind::foreign},      {"", "", Kind::foreign}};
+  for (const auto& [number, type, kind] : cases) {
+    const std::string found = wire::typeOfMount(kMounts, number).value_or("");
+    EXPECT_TRUE(found == type && wire::kindOfFileSystem(found) == kind) << number;
+  }
+  for (const char* type : {"fuse", "fuseblk", "nfs4", "cifs", "9p", "virtiofs", "ceph", "ext44"}) {
+    EXPECT_EQ(wire::kindOfFileSystem(type), Kind::foreign) << type;
+  }
+  EXPECT_EQ(wire::kindOfFileSystem("overlay"), Kind::stacked);
+}
+
+TEST(FileOrigin, OfDescriptors) {
+  const FileDescriptor memory(::memfd_create("x", MFD_CLOEXEC)),
+      process(::open("/proc/self/status", O_RDONLY)), directory(::open("/", O_RDONLY)),
+      socket(::socket(AF_UNIX, SOCK_STREAM, 0));
+  EXPECT_EQ(wire::FileOrigin::of(memory.get(), 0).kind, wire::FileOrigin::Kind::local);
+  EXPECT_EQ(wire::FileOrigin::of(process.get(), 0).fileSystem, "proc");
+  EXPECT_EQ(wire::FileOrigin::of(socket.get(), ::getpid()).kind, wire::FileOrigin::Kind::foreign);
+  EXPECT_TRUE(wire::isNoRegularFile(directory.get()) && wire::isNoRegularFile(socket.get()));
+  EXPECT_FALSE(wire::isNoRegularFile(memory.get()) || wire::isNoRegularFile(process.get()));
+}
+
+}  // namespace
+}  // namespace veltrad::platform
