@@ -4,10 +4,11 @@ import re
 import time
 
 from harness import storebag, wait_until
-from test_https import NAMES, Client, HTTPSTest, entry
+from test_https import Client, HTTPSTest, entry
 
 ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
 BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
+DESCRIBE = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 PROXY = "<3>sendMessageWithDictionary: Failed to get remote object proxy: "
 END = {"timestamp": 0.0, "category": 0, "type": 0}
 
@@ -112,7 +113,7 @@ class Family(HTTPSTest):
     def test_a_session_whose_user_info_has_gone_is_forgotten(self):
         with self.serving("user info provided without requiring it") as daemon:
             member = self.join(ROOT)
-            member.ask(NAMES, sessionInfo={"clientType": ROOT, "sessionID": member.number}, userInfo={},
+            member.ask(DESCRIBE, sessionInfo={"clientType": ROOT, "sessionID": member.number}, userInfo={},
                        frameworksToCheck=[], hasAggregationBlock=False)
             self.leave(daemon, member)
             child = self.join(CHILD)
