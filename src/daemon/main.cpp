@@ -93,12 +93,20 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
            platform::RunLoop& loop) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  bool used = false;
+  // Connections free their memory after their sessions have gone, each on its own thread.
+  constexpr int kTicksToReturnMemory = 3;
+  int returns = 0;
+  std::uint64_t accepted = 0;
   loop.run(tick, [&] {
     countersFile.writeSoon();
     const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
-    if (used && idle) platform::returnFreeMemory();
-    used = !idle;
+    // Sessions may come and go between two ticks.
+    if (!idle || std::exchange(accepted, agent.acceptedSessions()) != accepted) {
+      returns = kTicksToReturnMemory;
+    } else if (returns > 0) {
+      --returns;
+      platform::returnFreeMemory();
+    }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
   });
 }

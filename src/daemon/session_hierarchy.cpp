@@ -13,7 +13,7 @@ const CorrelatedList* VeltradAgent::correlatedList(const session::VeltradSession
   if (member && userInfo && membership->second.userInfo == userInfo) return membership->second.list;
   const std::string key = userInfoKeyForUserInfo(userInfo.get());
   if (member && membership->second.key == key) membership->second.userInfo = std::move(userInfo);
-  const auto list = _correlatedSessions.find(key);
+  const auto list = _correlatedSessions.find(std::string_view(key));
   return list == _correlatedSessions.end() ? nullptr : &list->second;
 }
 

@@ -55,6 +55,7 @@ void VeltradAgent::addSession(std::shared_ptr<session::VeltradSession> session) 
   const Lock held(_sessionListLock);
   if (_sessionList.empty()) _transaction.open();
   _sessionList.push_back(std::move(session));
+  _acceptedSessions.fetch_add(1, std::memory_order_relaxed);
   _sessionCount.store(_sessionList.size(), std::memory_order_relaxed);
 }
 
@@ -78,8 +79,12 @@ void VeltradAgent::leaveCorrelatedList(const session::VeltradSession& session) {
   CorrelatedList& list = *membership->second.list;
   _memberships.erase(membership);
   list.leave(session);
-  if (list.empty() && (key.size() > kLongestIdleKey || _correlatedSessions.size() > kMostKeys)) {
-    _correlatedSessions.erase(key);
+  if (list.empty()) {
+    if (key.size() > kLongestIdleKey || _correlatedSessions.size() > kMostKeys) {
+      _correlatedSessions.erase(_correlatedSessions.find(std::string_view(key)));
+    } else {
+      list = CorrelatedList();  // keeps nothing of its size
+    }
   }
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
@@ -113,7 +118,7 @@ void VeltradAgent::userInfoUpdatedForSession(const std::shared_ptr<session::Velt
   leaveCorrelatedList(*session);
   logDebug("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s", session->sessionID(),
            key.c_str());
-  CorrelatedList& list = _correlatedSessions[key];
+  CorrelatedList& list = _correlatedSessions.try_emplace(std::pmr::string(key)).first->second;
   list.join(session);
   _memberships[session.get()] = {key, &list, userInfo};
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);

@@ -5,6 +5,7 @@
 #include <atomic>
 #include <map>
 #include <memory>
+#include <memory_resource>
 #include <string>
 #include <unordered_map>
 #include <vector>
@@ -46,6 +47,8 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
 
   // Without a lock, for log lines and the service manager's status.
   std::size_t sessionCount() const { return _sessionCount.load(std::memory_order_relaxed); }
+  // All that ever came. Without a lock.
+  std::uint64_t acceptedSessions() const { return _acceptedSessions.load(std::memory_order_relaxed); }
   std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
 
  private:
@@ -72,8 +75,11 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
 
   RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
   StorebagCache _cachedStorebags GUARDED_BY(_lock);
-  // Empty lists stay, within a bound.
-  std::map<std::string, CorrelatedList> _correlatedSessions GUARDED_BY(_lock);
+  // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
+  // the sessions beside it have freed.
+  std::pmr::unsynchronized_pool_resource _listMemory GUARDED_BY(_lock);
+  std::pmr::map<std::pmr::string, CorrelatedList, std::less<>> _correlatedSessions GUARDED_BY(_lock){
+      &_listMemory};
   // The one list that a session is in. `userInfo` is the dictionary whose key was last seen to be this one,
   // so that a message does not form the key again.
   struct Membership {
@@ -85,6 +91,7 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
 
   // Kept beside the collections.
   std::atomic<std::size_t> _sessionCount{0};
+  std::atomic<std::uint64_t> _acceptedSessions{0};
   std::atomic<std::size_t> _userInfoKeyCount{0};
 };
 

@@ -89,6 +89,20 @@ class Memory(SystemTest):
         except (plistlib.InvalidFileException, OverflowError, TypeError, ValueError):
             pass  # a value that this writer cannot write
 
+    def test_a_crowd_that_comes_and_goes(self):
+        """Within a second, each client of an identity of its own."""
+        with self.serving("", env={"VELTRA_LOG": "error"}, serving=False) as daemon:
+            wait_until(lambda: pathlib.Path(self.root.socket).exists(), "the socket")
+            rest = self.at_rest(daemon)
+            crowd = [Wire(self.root) for _ in range(400)]
+            for number, wire in enumerate(crowd):
+                wire.describe(7, user_info={"clientName": f"client {number}", "more": "x" * 20_000})
+                wire.begin("startConfigWithCompletionHandler:")
+            for wire in crowd:
+                wire.close()
+            wait_until(lambda: self.resident(daemon) - rest < 8 * MIB, "memory back", 10,
+                       lambda: f"{(self.resident(daemon) - rest) / MIB:.1f} MiB above rest")
+
     def test_posting(self):
         self.lab.put("ostvane", storebag(sampling_threshold=0, override_sampling=1))
         with self.serving("", env={"VELTRA_LOG": "error"}, serving=False) as daemon:
