@@ -60,8 +60,9 @@ TEST(Upload, RemovesForThoseWhoAskForNoAnswerAndOnlyWhatTheCallLent) {
     if (call.callID == 0) return;
     const std::string path = *call.args().string("path");
     const std::uint32_t named = path.ends_with("kept") ? call.callID + 1 : call.callID;
-    link.send(wire::makeFrame(wire::FrameKind::event, 0,
-                              {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", named}}}}));
+    link.send(
+        wire::makeFrame(wire::FrameKind::event, 0,
+                        {{"op", wire::event::kRemoveUploadedFile}, {"args", Dictionary{{"call", named}}}}));
     link.send(replyFrame(call.callID, {{"uploaded", true}}));
   });
   veltra::Session session = open(daemon);

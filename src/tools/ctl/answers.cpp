@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include "formats/json.h"
+#include "wire/constants.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -38,7 +39,7 @@ std::string formatError(const std::optional<AnswerError>& error) {
 Answer answerOfFailure(veltra_status status) {
   Answer answer;
   answer.status = status;
-  answer.error = AnswerError{"com.florn.veltra.error", -1, veltra_status_text(status)};
+  answer.error = AnswerError{wire::kVeltraErrorDomain, -1, veltra_status_text(status)};
   return answer;
 }
 
