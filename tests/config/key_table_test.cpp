@@ -25,38 +25,24 @@ using Tables =
 TYPED_TEST_SUITE(KeyTable, Tables);
 
 struct Sample {
+  KeyType type;
   std::vector<Value> right, wrong;
 };
+const Value kNone(Dictionary{}), kNaN(std::nan("")), kInfinite(std::numeric_limits<double>::infinity());
+const Sample kSamples[] = {
+    {KeyType::text, {"remove"}, {1, true, Array{"remove"}, kNone}},
+    {KeyType::url, {"https://a"}, {1, Array{}}},
+    {KeyType::names, {"a", "a,b", ""}, {1, Array{"a"}}},
+    {KeyType::texts, {Value(Array{"a", 1})}, {"a", 1, kNone, Array{}, Array{1}}},
+    {KeyType::integer, {3, 3.9, true}, {"3", kNaN, kInfinite, 1e300, Array{3}}},
+    {KeyType::real, {3, 0.5, true, 1e300}, {"0.5", kNaN, kInfinite, Array{}}},
+    {KeyType::presence, {"", 0, false, Array{}, kNone, kNaN}, {}},
+    {KeyType::dictionary, {kNone}, {Array{}, "x", 1}},
+    {KeyType::dictionaries, {Array{}, Array{1}, Array{kNone}}, {kNone, "x", 1}},
+};
 const Sample& sampleOf(KeyType type) {
-  static const Dictionary empty;
-  static const Value nan(std::nan("")), infinite(std::numeric_limits<double>::infinity());
-  static const Sample text{{"remove"}, {1, true, Array{"remove"}, empty}}, url{{"https://a"}, {1, Array{}}},
-      names{{"a", "a,b", ""}, {1, Array{"a"}}}, texts{{Value(Array{"a", 1})}, {"a", 1, empty, Array{}, Array{1}}},
-      integer{{3, 3.9, true}, {"3", nan, infinite, 1e300, Array{3}}},
-      real{{3, 0.5, true, 1e300}, {"0.5", nan, infinite, Array{}}},
-      presence{{"", 0, false, Array{}, empty, nan}, {}}, dictionary{{empty}, {Array{}, "x", 1}},
-      dictionaries{{Array{}, Array{1}, Array{empty}}, {empty, "x", 1}};
-  switch (type) {
-    case KeyType::text:
-      return text;
-    case KeyType::url:
-      return url;
-    case KeyType::names:
-      return names;
-    case KeyType::texts:
-      return texts;
-    case KeyType::integer:
-      return integer;
-    case KeyType::real:
-      return real;
-    case KeyType::presence:
-      return presence;
-    case KeyType::dictionary:
-      return dictionary;
-    case KeyType::dictionaries:
-      break;
-  }
-  return dictionaries;
+  return *std::find_if(std::begin(kSamples), std::end(kSamples),
+                       [&](const Sample& s) { return s.type == type; });
 }
 
 TYPED_TEST(KeyTable, ReadsEachKeyByItsType) {

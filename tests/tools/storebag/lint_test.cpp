@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <map>
 
 #include "config/storebag_content.h"
 
@@ -30,28 +31,16 @@ Dictionary clients(const Value& entries) {
       Dictionary{{"httppost", Dictionary{{"clients", entries}}}, {"mivo", Dictionary{{"active", true}}}});
 }
 
-Value valueOf(KeyType type) {
-  switch (type) {
-    case KeyType::text:
-      return "remove";
-    case KeyType::url:
-      return "https://c.example/e";
-    case KeyType::names:
-      return "a,b";
-    case KeyType::texts:
-      return Array{"US"};
-    case KeyType::integer:
-    case KeyType::real:
-      return 1;
-    case KeyType::dictionary:
-      return Dictionary{};
-    case KeyType::dictionaries:
-      return Array{Dictionary{}};
-    case KeyType::presence:
-      break;
-  }
-  return "anything";
-}
+// Of each type.
+const std::map<KeyType, Value> kRight{{KeyType::text, "remove"},
+                                      {KeyType::url, "https://c.example/e"},
+                                      {KeyType::names, "a,b"},
+                                      {KeyType::texts, Array{"US"}},
+                                      {KeyType::integer, 1},
+                                      {KeyType::real, 1},
+                                      {KeyType::presence, "anything"},
+                                      {KeyType::dictionary, Dictionary{}},
+                                      {KeyType::dictionaries, Array{Dictionary{}}}};
 
 // `storebagAround` puts a dictionary of the table at its place in a storebag.
 void everyKeyIsKnown(const config::KeyTable& table, const std::string& place,
@@ -62,7 +51,7 @@ void everyKeyIsKnown(const config::KeyTable& table, const std::string& place,
     const auto findings = [&](const Value& value, const std::string& more = "") {
       return lintStorebag(storebagAround({{key.name + more, value}}));
     };
-    const Value right = valueOf(key.type);
+    const Value& right = kRight.at(key.type);
     EXPECT_THAT(findings(right), Not(Contains(testing::ContainsRegex(at + "(unknown .*|no )?" + name))));
     EXPECT_THAT(findings(right, "x"), Contains(testing::ContainsRegex(at + "unknown .*" + key.name +
                                                                       "x.*: expected .*" + key.name)));
