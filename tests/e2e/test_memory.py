@@ -15,7 +15,7 @@ LOG_DATA = "uploadLogData:completionHandler:"
 CLIENTS = 12
 VALUES = (
     lambda r: "x" * r.choice((1, 200, 900_000)),
-    lambda r: "\x01" * r.choice((20, 300_000)),
+    lambda r: "\x01" * r.choice((20, 900_000)),
     lambda r: "€\U0001f600" * r.choice((9, 60_000)),
     lambda r: b"\0" * r.choice((1, 900_000)),
     lambda r: [{}] * r.choice((1, 49_000)),
