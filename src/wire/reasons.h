@@ -1,9 +1,9 @@
-// Why a message, or what carries it, fared as it did: one table for counters, tools and both ends of the
-// socket.
+// Why a message, or what carries it, fared as it did: one table for counters, tools and both ends.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
+#include <iterator>
 #include <string_view>
 
 namespace veltrad::wire {
@@ -15,36 +15,18 @@ enum class Reason : std::uint8_t {
 #undef VELTRA_REASON
 };
 
-// What a count counts.
-enum class Concern : std::uint8_t {
-  message,
-  event,
-  event_field,
-  energy_event,
-  datagram,
-  acknowledgement,
-  file,
-  log_data,
-  log_line,
-  connection,
-  call,
-  reply,
-  session,
-  backend,
-};
-
 struct ReasonEntry {
-  Concern concern;
-  std::string_view name;  // [a-z][a-z0-9_]*, for programs
-  std::string_view text;  // what happened, then why; the key in run/veltrad/counters.json
+  std::string_view concern;  // what is counted: "message", "log data"
+  std::string_view name;     // [a-z][a-z0-9_]*, for programs
+  std::string_view text;     // what happened, then why; the key in run/veltrad/counters.json
 };
 
 inline constexpr ReasonEntry kReasons[] = {
-#define VELTRA_REASON(concern, name, text) {Concern::concern, #name, text},
+#define VELTRA_REASON(concern, name, text) {concern, #name, text},
 #include "wire/reasons.def"
 #undef VELTRA_REASON
 };
-inline constexpr std::size_t kReasonCount = sizeof kReasons / sizeof *kReasons;
+inline constexpr std::size_t kReasonCount = std::size(kReasons);
 
 constexpr const ReasonEntry& entryOf(Reason reason) {
   return kReasons[static_cast<std::size_t>(reason)];

@@ -59,14 +59,9 @@ void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eve
     return;
   }
   const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
-  if (first.sent) _counters.count(wire::Reason::datagram_sent);
-  if (!first.sent && !first.notKept) _counters.count(wire::Reason::datagram_held);
-  if (first.notKept) {
-    _counters.count(first.sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold);
-  }
-  if (first.pushedOut) {
-    _counters.count(_kind.shared ? wire::Reason::shared_datagrams_wait : wire::Reason::datagrams_wait);
-  }
+  if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
+  _counters.count(first.fate);
+  if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
 }
 

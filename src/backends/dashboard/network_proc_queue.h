@@ -16,7 +16,6 @@
 #include "backends/dashboard/udp_socket.h"
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
-#include "wire/reasons.h"
 
 namespace veltrad::platform {
 class Counters;

@@ -149,21 +149,20 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::u
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  const bool kept = keep(std::move(event), size, method, sessionIDChanges);
-  _services.counters.count(kept ? wire::Reason::event_batched : wire::Reason::event_over_share);
+  _services.counters.count(keep(std::move(event), size, method, sessionIDChanges));
   return flushed;
 }
 
-// False: there is no room for it, even without what the user's other batches hold.
-bool HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
-                            std::uint64_t sessionIDChanges) {
+// Batched, or there is no room for it, even without what the user's other batches hold.
+wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
+                                    std::uint64_t sessionIDChanges) {
   platform::MemoryAccount* account = memoryAccount().get();
   auto charge = account ? account->keep(size.charged) : platform::Charge();
-  if (!charge) return false;
+  if (!charge) return wire::Reason::event_over_share;
   if (account && !std::exchange(_evictable, true)) account->add(_held);
   _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
              sessionIDChanges);
-  return true;
+  return wire::Reason::event_batched;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
