@@ -27,7 +27,7 @@ class MessageQueue {
   using Send = std::function<bool(std::string_view datagram)>;
 
   struct First {
-    wire::Reason fate;                      // sent, held, or one of no memory to wait with
+    wire::Reason fate;                      // sent, held, or no memory to wait
     std::optional<wire::Reason> pushedOut;  // of the oldest, which made room
   };
   struct Tick {
