@@ -200,7 +200,7 @@ bool chargeCall(CallMemory& memory, std::size_t bytes) {
 
 std::string usedUp(CallMemory& memory) {
   memory.usedUp = true;
-  memory.counters.count("call refused: its user's memory is used up");
+  memory.counters.count(wire::Reason::call_over_share);
   return fmt::format("the memory that the daemon keeps for uid {} is used up; try again later",
                      memory.account->uid());
 }
