@@ -1,5 +1,5 @@
-"""Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its place;
-the exit status is 1 if there is any."""
+"""Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
+place; the exit status is 1 if there is any."""
 import re
 import subprocess
 import sys

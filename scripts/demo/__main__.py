@@ -34,7 +34,7 @@ def stay(root, lab):
     print(f"  {control} stats")
     print(f"  VELTRA_ROOT={root.path} {program('hello')}")
     print(f"  open {lab.url}/ in a browser: shows what arrives (the certificate is self-signed by the lab)")
-    print(f"  edit {lab.path}/storebags/ostvane.json: the configuration that the daemon gets (signed at each request)", flush=True)
+    print(f"  edit {lab.path}/storebags/ostvane.json: the daemon's configuration, signed at each request", flush=True)
     stopped = threading.Event()
     for number in (signal.SIGINT, signal.SIGTERM):
         signal.signal(number, lambda *_: stopped.set())

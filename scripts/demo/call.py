@@ -143,5 +143,5 @@ def show(root, lab, daemon):
     if "httppost" in json.loads(lamp.splitlines()[0])["backends"]:
         problems.append("the lamp was told that it reports to the collector")
     if not problems:
-        heading(f"{expected} of {expected} events of the phone arrived and none of the lamp; the dashboard got {taken()} messages")
+        heading(f"{expected} of {expected} events of the phone arrived, none of the lamp; the dashboard got {taken()} messages")
     return problems
