@@ -260,7 +260,7 @@ class Events(HTTPSTest):
                                 [None, secret, opus, one, None, 1]])
         self.assertNotIn('"secret"', json.dumps(post))
 
-    def test_the_limit_counts_by_the_event_s_own_method(self):
+    def test_the_threshold_is_not_affected_by_a_filter_on_the_method(self):
         self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
         with self.serving():
             client = self.client(batchEvent=True)

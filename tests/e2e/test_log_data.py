@@ -37,7 +37,7 @@ class LogData(SystemTest):
         wait_until(lambda: len(places()) >= 3, "three announcements")
         self.assertEqual(sorted(places()), [line["answer"] for line in (first, second, many)])
 
-    def test_nobody_takes_it(self):
+    def test_failed_uploads_and_wrong_files(self):
         with self.serving("Log data array upload failed"):
             self.assertIn("Nobody took", self.upload([1], status=1)[1])
         for data, problem in (("[1", "logs.json: not JSON"), ("{}", "expected an array, found an object")):

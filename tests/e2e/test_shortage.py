@@ -13,7 +13,7 @@ NOBODY = 65534
 
 class Shortage(SystemTest):
     def limit(self, daemon, more=None):
-        """So many descriptors from the lowest free one on; nothing: as many as at the start."""
+        """Allows `more` descriptors from the lowest free one on; None restores the original limit."""
         pid = daemon.popen.pid
         hard = resource.prlimit(pid, resource.RLIMIT_NOFILE)[1]
         used = {int(number) for number in os.listdir(f"/proc/{pid}/fd")}

@@ -76,7 +76,7 @@ class Stress(HTTPSTest):
         return subprocess.Popen([sys.executable, __file__, str(self.root.path), str(seed)], stderr=subprocess.PIPE)
 
     def left_over(self, daemon):
-        """How many descriptors, but for connections that are kept, and threads."""
+        """The numbers of descriptors, without kept connections, and of threads."""
         own = [name for name in daemon.descriptors() if not name.startswith("socket:")]
         return len(own), daemon.status("Threads")
 
