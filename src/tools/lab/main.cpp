@@ -26,10 +26,8 @@ Prints one JSON line when it is ready, writes what arrives to DIR/received, and 
   POST   /logdata                log data; the answer is the place where it is stored
   POST   /upload                 a gzipped file; the answer is {"success": true}
   POST   /events, /realtime, …   the event collector
-  POST   /control                add a rule for misbehaviour: the body is a JSON object, see below
-  DELETE /control                remove all rules
-  GET    /received?kind=events   what arrived, one JSON object per line. Other kinds: storebags, dashboard,
-                                 logdata, uploads
+  POST   /control                add a rule for misbehaviour: the body is JSON, see below. DELETE: remove all rules
+  GET    /received?kind=events   what arrived, one JSON object per line. Also: storebags, dashboard, logdata, uploads
   GET    /                       a page with the newest arrivals
 
 Keys of a rule: path (a prefix), times, share (per cent), status, delayMs, dripMs (pause between the bytes of
