@@ -16,10 +16,10 @@ bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
 }
 
 std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& services,
-                                                       const std::string& name, const Dictionary* profile,
+                                                       const std::string& name,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, profile, productFamily));
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -29,9 +29,9 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& se
   return backend;
 }
 
-MivoBackend::MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
+MivoBackend::MivoBackend(const BackendServices& services, const std::string& name,
                          const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
+    : VeltraBackend(name, productFamily, services.random),
       _counters(services.counters),
       _clientBundle(services.adaptorBundle) {}
 
@@ -53,8 +53,7 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
-    _counters.count(_mivoAdaptor ? "message dropped: the adaptor does not take messages"
-                                 : "message dropped: there is no adaptor");
+    _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
     return std::nullopt;
   }
   const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, method, respCode, payload);
@@ -62,7 +61,7 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
   }
-  _counters.count(thrown ? "message lost: the adaptor threw" : "message handed to the adaptor");
+  _counters.count(thrown ? wire::Reason::adaptor_threw : wire::Reason::handed_to_adaptor);
   return std::nullopt;
 }
 
