@@ -4,8 +4,8 @@
 
 namespace {
 
-struct Agent {
-  veltrad::Mutex lock AGENT_LOCK{veltrad::LockRank::agent};
+struct Families {
+  veltrad::Mutex lock FAMILIES_LOCK{veltrad::LockRank::families};
 };
 struct Session {
   veltrad::Mutex lock SESSION_LOCK{veltrad::LockRank::session};
@@ -17,19 +17,19 @@ struct Leaf {
 }  // namespace
 
 #ifndef WRONG_ORDER
-void inOrder(Agent& agent, Session& session, Leaf& leaf) {
-  const veltrad::Lock first(agent.lock);
+void inOrder(Families& families, Session& session, Leaf& leaf) {
+  const veltrad::Lock first(families.lock);
   const veltrad::Lock second(session.lock);
   const veltrad::Lock third(leaf.lock);
 }
 #elif WRONG_ORDER == 1
-void sessionThenAgent(Agent& agent, Session& session) {
+void sessionThenFamilies(Families& families, Session& session) {
   const veltrad::Lock first(session.lock);
-  const veltrad::Lock second(agent.lock);
+  const veltrad::Lock second(families.lock);
 }
 #else
-void leafThenAgent(Agent& agent, Leaf& leaf) {
+void leafThenFamilies(Families& families, Leaf& leaf) {
   const veltrad::Lock first(leaf.lock);
-  const veltrad::Lock second(agent.lock);
+  const veltrad::Lock second(families.lock);
 }
 #endif

@@ -1,5 +1,5 @@
-// Events to one client. Any thread.
-#include "ipc/remote_object.h"
+// Frames of events, and why one is dropped.
+#include "ipc/client_events.h"
 
 #include <fmt/format.h>
 
@@ -7,32 +7,29 @@
 
 namespace veltrad::ipc {
 
-void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, double timestamp,
-                                       std::uint16_t category, std::uint16_t type,
-                                       std::optional<Dictionary> payload) {
+std::string messageToClient(std::optional<Dictionary> sessionInfo, double timestamp, std::uint16_t category,
+                            std::uint16_t type, std::optional<Dictionary> payload) {
   Dictionary arguments{{"timestamp", timestamp}, {"category", unsigned{category}}, {"type", unsigned{type}}};
   if (sessionInfo) arguments.set("sessionInfo", std::move(*sessionInfo));
   if (payload) arguments.set("payload", std::move(*payload));
   Dictionary body{{"op", "sendMessageToClient:timestamp:category:type:payload:"}};
   body.set("args", std::move(arguments));
-  const std::string frame = wire::makeFrame(wire::FrameKind::event, 0, std::move(body));
-  const OutQueue::Sent sent = _out->sendEvent(frame);
-  if (sent == OutQueue::Sent::done || !_handler) return;
-  switch (sent) {
+  return wire::makeFrame(wire::FrameKind::event, 0, std::move(body));
+}
+
+std::optional<std::string> sendEvent(OutQueue& out, std::string_view frame) {
+  switch (out.sendEvent(frame)) {
     case OutQueue::Sent::full:
-      _handler(
-          fmt::format("The client does not read: more than {} bytes would wait for it.", kOutQueueBound));
-      return;
+      return fmt::format("The client does not read: more than {} bytes would wait for it.", kOutQueueBound);
     case OutQueue::Sent::tooLarge:
-      _handler(fmt::format("The event of {} bytes is larger than a frame may be ({} bytes).",
-                           frame.size() - wire::kFrameHeaderBytes, wire::kFrameBodyLimit));
-      return;
+      return fmt::format("The event of {} bytes is larger than a frame may be ({} bytes).",
+                         frame.size() - wire::kFrameHeaderBytes, wire::kFrameBodyLimit);
     case OutQueue::Sent::gone:
-      _handler("The client has gone.");
-      return;
+      return "The client has gone.";
     case OutQueue::Sent::done:
-      return;
+      break;
   }
+  return std::nullopt;
 }
 
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {

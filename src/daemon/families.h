@@ -1,0 +1,68 @@
+// Families: sessions that share an identity, and what that makes of each: its parent, its combined ID, its
+// back ends' states, the one client that gets copies.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <map>
+#include <memory_resource>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+#include "base/mutex.h"
+#include "daemon/correlated_list.h"
+
+namespace veltrad::daemon {
+
+// Any thread; one lock. Knows of a session what it was told, and calls none: under the lock it reads and sets
+// states and IDs of back ends and queues copies and end marks, which wait for nobody. What a refresh has
+// computed is set before the lock is let go, or an older one could follow a newer one.
+class Families {
+ public:
+  // Of a member; nothing for others.
+  void sessionInfoUpdated(session::FamilyFacts facts);
+  void userInfoUpdatedForSession(session::FamilyFacts facts);
+  void updateDownstreamSessions(session::FamilyFacts facts);
+  void leave(const session::Aggregation& session);
+
+  bool ancestorAggregates(const session::FamilyPlace& place);
+  session::CopySent sendToAncestor(const session::FamilyPlace& place, std::string_view copy);
+
+  // Without a lock.
+  std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
+
+ private:
+  using Lists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;
+  struct Member : FamilyMember {
+    std::string key;       // of the user info that it told last
+    Lists::iterator home;  // the one list that it is in
+  };
+  using Members = std::unordered_map<const session::Aggregation*, Member>;
+
+  // What they give back or swap away goes after the lock.
+  void tell(Member& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
+  Members::node_type takeOut(const session::Aggregation& session) REQUIRES(_lock);
+  const CorrelatedList* list(std::string_view key) const REQUIRES(_lock);
+  const CorrelatedList* listHolding(const Member& member, const char* operation) const REQUIRES(_lock);
+  std::optional<std::string> parentSessionIDString(const Member& member) const REQUIRES(_lock);
+  const FamilyMember* parentSession(const Member& member) const REQUIRES(_lock);
+  const FamilyMember* ancestorWithAggregator(const session::FamilyPlace& place) const REQUIRES(_lock);
+  void updateCombinedSessionID(const Member& member) const REQUIRES(_lock);
+  void syncReportingStates(const Member& member) const REQUIRES(_lock);
+  // The lines that are to be logged once the lock is released.
+  std::vector<std::string> refresh(Member& member) REQUIRES(_lock);
+
+  Mutex _lock FAMILIES_LOCK{LockRank::families};
+  // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
+  // the sessions beside it have freed.
+  std::pmr::unsynchronized_pool_resource _listMemory GUARDED_BY(_lock);
+  Lists _correlatedSessions GUARDED_BY(_lock){&_listMemory};
+  Members _members GUARDED_BY(_lock);
+
+  std::atomic<std::size_t> _userInfoKeyCount{0};
+};
+
+}  // namespace veltrad::daemon
