@@ -108,7 +108,9 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   _storebagVersion = _sessionDelegate.storebagVersionForSession(*this);
   createBackendsWithStorebag(*storebag);
   updateSessionWithDefaultSessionInfo();
-  sendStartMessage();
+  internalSendMessage(
+      startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
+      0);
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
@@ -129,23 +131,12 @@ void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
   }
 }
 
-void VeltradSession::sendStartMessage() {
-  internalSendMessage(
-      startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
-      0);
-}
-
 void VeltradSession::updateSessionWithDefaultSessionInfo() {
   _sessionDelegate.userInfoUpdatedForSession(familyFacts());
   if (_backends) {
     for (const auto& [name, backend] : *_backends) backend->updateState();
   }
   _sessionDelegate.updateDownstreamSessions(familyFacts());
-}
-
-void VeltradSession::updateUserInfoForBackends() {
-  if (!_backends) return;
-  for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
 }
 
 std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
@@ -172,7 +163,9 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
                          sameName(*current, *updated, wire::kVeltraUserInfoClientName) &&
                          sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
   keepUserInfo(std::move(updated));
-  updateUserInfoForBackends();
+  if (_backends) {
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
+  }
   if (unchanged) return _sessionDelegate.sessionInfoUpdated(familyFacts());
   logDebug("receivedUserInfo: Received new user info for session %u", _sessionID);
   updateSessionWithDefaultSessionInfo();
