@@ -3,8 +3,9 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
-#include <memory>
+#include <memory_resource>
 #include <string>
 #include <utility>
 #include <vector>
@@ -21,14 +22,7 @@ struct AncestorIDs {
   bool complete = true;
 };
 
-// A session as its family knows it.
-struct FamilyMember {
-  session::FamilyFacts facts;
-  // While it is in a list, which alone changes them. The level is the hierarchy number at the last
-  // refreshLevel().
-  std::int32_t level = 0;
-  std::uint64_t joined = 0;
-};
+struct FamilyMember;
 
 // Members outlive their time in it.
 class CorrelatedList {
@@ -50,6 +44,18 @@ class CorrelatedList {
  private:
   std::uint64_t _nextJoined = 0;
   std::map<std::pair<std::int64_t, std::uint64_t>, const FamilyMember*> _members;  // by level, then joining
+};
+
+using CorrelatedLists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;  // by user-info key
+
+// A session as its family knows it.
+struct FamilyMember {
+  session::FamilyFacts facts;      // that it told last
+  std::string key;                 // of the user info in them
+  CorrelatedLists::iterator home;  // the one list that it is in
+  // That list's alone. The level is the hierarchy number at the last refreshLevel().
+  std::int32_t level = 0;
+  std::uint64_t joined = 0;
 };
 
 }  // namespace veltrad::daemon

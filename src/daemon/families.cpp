@@ -15,7 +15,7 @@ constexpr std::size_t kMostKeys = 4096;
 constexpr std::size_t kLongestIdleKey = 256;  // bytes
 }  // namespace
 
-void Families::tell(Member& member, session::FamilyFacts& facts, std::string& key) {
+void Families::tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) {
   std::swap(member.facts, facts);
   std::swap(member.key, key);
 }
@@ -40,7 +40,7 @@ void Families::userInfoUpdatedForSession(session::FamilyFacts facts) {
   logDebug("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s", facts.sessionID,
            key.c_str());
   const auto home = _correlatedSessions.try_emplace(std::pmr::string(key)).first;
-  const auto member = _members.try_emplace(session, Member{{std::move(facts)}, key, home}).first;
+  const auto member = _members.try_emplace(session, FamilyMember{std::move(facts), key, home}).first;
   home->second.join(member->second);
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
@@ -68,7 +68,7 @@ const CorrelatedList* Families::list(std::string_view key) const {
 }
 
 // The list of the key that the session told last; null, with a log line, where it is not in it.
-const CorrelatedList* Families::listHolding(const Member& member, const char* operation) const {
+const CorrelatedList* Families::listHolding(const FamilyMember& member, const char* operation) const {
   const CorrelatedList* named = list(member.key);
   if (!named || named->empty()) {
     logError("%s: ERROR: No sessions found for user info key %s", operation, member.key.c_str());
@@ -82,7 +82,7 @@ const CorrelatedList* Families::listHolding(const Member& member, const char* op
   return named;
 }
 
-std::optional<std::string> Families::parentSessionIDString(const Member& member) const {
+std::optional<std::string> Families::parentSessionIDString(const FamilyMember& member) const {
   if (member.level == 0) return std::nullopt;
   logDebug("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", member.key.c_str(),
            member.facts.sessionID);
@@ -99,7 +99,7 @@ std::optional<std::string> Families::parentSessionIDString(const Member& member)
   return std::move(ids.text);
 }
 
-const FamilyMember* Families::parentSession(const Member& member) const {
+const FamilyMember* Families::parentSession(const FamilyMember& member) const {
   if (member.level == 0) return nullptr;
   logDebug("parentSessionForChild: Checking userInfoKey '%s' for session %u", member.key.c_str(),
            member.facts.sessionID);
@@ -135,7 +135,7 @@ session::CopySent Families::sendToAncestor(const session::FamilyPlace& place, st
   return ancestor ? ancestor->facts.aggregation->sendToAggregator(copy) : session::CopySent();
 }
 
-void Families::updateCombinedSessionID(const Member& member) const {
+void Families::updateCombinedSessionID(const FamilyMember& member) const {
   const auto ancestors = parentSessionIDString(member);
   if (!ancestors) return;
   const std::string combined = *ancestors + "." + member.facts.sessionIDString;
@@ -145,7 +145,7 @@ void Families::updateCombinedSessionID(const Member& member) const {
   for (const auto& [name, backend] : *member.facts.backends) backend->setCorrelatedSessionID(combined);
 }
 
-void Families::syncReportingStates(const Member& member) const {
+void Families::syncReportingStates(const FamilyMember& member) const {
   const FamilyMember* parent = parentSession(member);
   if (!member.facts.backends) return;
   if (parent) return session::syncReportingStates(*member.facts.backends, parent->facts.backends.get());
@@ -177,7 +177,7 @@ void Families::updateDownstreamSessions(session::FamilyFacts facts) {
   for (const std::string& line : lines) logError("%s", line.c_str());
 }
 
-std::vector<std::string> Families::refresh(Member& member) {
+std::vector<std::string> Families::refresh(FamilyMember& member) {
   std::vector<std::string> lines;
   const auto shutDown = [&lines](const FamilyMember& ending) {
     const session::FamilyFacts& facts = ending.facts;
@@ -190,15 +190,14 @@ std::vector<std::string> Families::refresh(Member& member) {
   syncReportingStates(member);
   const bool ancestorAggregates = list.topmostAggregator(member.level) != nullptr;
   if (ancestorAggregates) shutDown(member);
-  for (const FamilyMember* each : list.below(member.level)) {
-    const Member& below = static_cast<const Member&>(*each);
+  for (const FamilyMember* below : list.below(member.level)) {
     logDebug(
         "updateDownstreamSessions: Updating combined session ID and syncing reporting states for session %u",
-        below.facts.sessionID);
-    updateCombinedSessionID(below);
-    syncReportingStates(below);
+        below->facts.sessionID);
+    updateCombinedSessionID(*below);
+    syncReportingStates(*below);
     const bool above = member.facts.aggregation->active() || ancestorAggregates;
-    if (above && below.facts.aggregation->active()) shutDown(below);
+    if (above && below->facts.aggregation->active()) shutDown(*below);
   }
   return lines;
 }

@@ -4,7 +4,6 @@
 
 #include <atomic>
 #include <cstddef>
-#include <map>
 #include <memory_resource>
 #include <optional>
 #include <string>
@@ -35,31 +34,26 @@ class Families {
   std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
 
  private:
-  using Lists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;
-  struct Member : FamilyMember {
-    std::string key;       // of the user info that it told last
-    Lists::iterator home;  // the one list that it is in
-  };
-  using Members = std::unordered_map<const session::Aggregation*, Member>;
+  using Members = std::unordered_map<const session::Aggregation*, FamilyMember>;
 
   // What they give back or swap away goes after the lock.
-  void tell(Member& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
+  void tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
   Members::node_type takeOut(const session::Aggregation& session) REQUIRES(_lock);
   const CorrelatedList* list(std::string_view key) const REQUIRES(_lock);
-  const CorrelatedList* listHolding(const Member& member, const char* operation) const REQUIRES(_lock);
-  std::optional<std::string> parentSessionIDString(const Member& member) const REQUIRES(_lock);
-  const FamilyMember* parentSession(const Member& member) const REQUIRES(_lock);
+  const CorrelatedList* listHolding(const FamilyMember& member, const char* operation) const REQUIRES(_lock);
+  std::optional<std::string> parentSessionIDString(const FamilyMember& member) const REQUIRES(_lock);
+  const FamilyMember* parentSession(const FamilyMember& member) const REQUIRES(_lock);
   const FamilyMember* ancestorWithAggregator(const session::FamilyPlace& place) const REQUIRES(_lock);
-  void updateCombinedSessionID(const Member& member) const REQUIRES(_lock);
-  void syncReportingStates(const Member& member) const REQUIRES(_lock);
+  void updateCombinedSessionID(const FamilyMember& member) const REQUIRES(_lock);
+  void syncReportingStates(const FamilyMember& member) const REQUIRES(_lock);
   // The lines that are to be logged once the lock is released.
-  std::vector<std::string> refresh(Member& member) REQUIRES(_lock);
+  std::vector<std::string> refresh(FamilyMember& member) REQUIRES(_lock);
 
   Mutex _lock FAMILIES_LOCK{LockRank::families};
   // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
   // the sessions beside it have freed.
   std::pmr::unsynchronized_pool_resource _listMemory GUARDED_BY(_lock);
-  Lists _correlatedSessions GUARDED_BY(_lock){&_listMemory};
+  CorrelatedLists _correlatedSessions GUARDED_BY(_lock){&_listMemory};
   Members _members GUARDED_BY(_lock);
 
   std::atomic<std::size_t> _userInfoKeyCount{0};
