@@ -5,6 +5,7 @@
 #include <new>
 
 #include "config/client_types.h"
+#include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "platform/clock.h"
 #include "platform/log.h"
@@ -25,10 +26,10 @@ struct StorebagCache::Download {
   std::optional<std::string> version = std::nullopt;
   bool notModified = false;
   bool attempted = true;
-  std::optional<Dictionary> section = std::nullopt;
+  std::shared_ptr<const config::StorebagSection> section = nullptr;
 };
 
-std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType) {
+std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
   Download download;
   if (name) {
@@ -82,20 +83,20 @@ StorebagRecord& StorebagCache::settledRecord(const std::string& name) {
   return record;
 }
 
-std::shared_ptr<const Dictionary> StorebagCache::taken(std::int32_t clientType, StorebagRecord& record,
-                                                       Download download) {
+std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t clientType,
+                                                                    StorebagRecord& record,
+                                                                    Download download) {
   settle(record);
   if (!download.attempted) {
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    if (record.data || !download.section) return record.data;
-    return std::make_shared<const Dictionary>(std::move(*download.section));
+    return record.data ? record.data : download.section;
   }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", download.maxAge);
-  record.fetchSuccessful = download.section.has_value() || download.notModified;
+  record.fetchSuccessful = download.section != nullptr || download.notModified;
   if (download.section) {
-    record.data = std::make_shared<const Dictionary>(std::move(*download.section));
+    record.data = std::move(download.section);
     record.version = std::move(download.version);
   } else if (!download.notModified) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);

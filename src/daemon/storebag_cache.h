@@ -8,10 +8,10 @@
 #include <string>
 
 #include "base/mutex.h"
-#include "base/value.h"
 
 namespace veltrad::config {
 class StorebagSource;
+struct StorebagSection;
 }  // namespace veltrad::config
 
 namespace veltrad::platform {
@@ -22,11 +22,12 @@ namespace veltrad::daemon {
 
 // What is kept of one storebag. Made at the first fetch for its name, never removed.
 struct StorebagRecord {
-  std::shared_ptr<const Dictionary> data;  // "StorebagData": the section last obtained; kept through failures
-  std::optional<std::string> version;      // "StorebagVersion"
-  double fetchTime = 0;          // "StorebagFetchTime": when the last attempt ended, seconds since 1970
-  bool fetchSuccessful = false;  // "StorebagFetchState": "Fetch Successful" or "Fetch Failure"
-  std::int32_t maxAge = 0;       // "StorebagMaxAge", seconds
+  std::shared_ptr<const config::StorebagSection>
+      data;                            // "StorebagData": the section last obtained; kept through failures
+  std::optional<std::string> version;  // "StorebagVersion"
+  double fetchTime = 0;                // "StorebagFetchTime": when the last attempt ended, seconds since 1970
+  bool fetchSuccessful = false;        // "StorebagFetchState": "Fetch Successful" or "Fetch Failure"
+  std::int32_t maxAge = 0;             // "StorebagMaxAge", seconds
   std::optional<std::string> lastModified;  // "StorebagLastModified"
   bool attempted = false;                   // a first attempt has ended
   bool beingFetched = false;                // requests for this name wait and look again
@@ -47,7 +48,7 @@ class StorebagCache {
 
   // The section for the client type, or null. May wait for an exchange with the server, its own or another's
   // for the same name, without the lock.
-  std::shared_ptr<const Dictionary> storebagForClientType(std::int32_t clientType);
+  std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
 
  private:
@@ -58,8 +59,8 @@ class StorebagCache {
   // The record of this name, once nobody fetches it.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
   // What the session gets.
-  std::shared_ptr<const Dictionary> taken(std::int32_t clientType, StorebagRecord& record, Download download)
-      REQUIRES(_lock);
+  std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,
+                                                       Download download) REQUIRES(_lock);
 
   config::StorebagSource& _source;
   const platform::Clock& _clock;

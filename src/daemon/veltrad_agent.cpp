@@ -45,7 +45,8 @@ void VeltradAgent::sessionInvalidated(const std::shared_ptr<session::VeltradSess
   _families.leave(session->aggregation());
 }
 
-std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const session::VeltradSession& session) {
+std::shared_ptr<const config::StorebagSection> VeltradAgent::storebagForSession(
+    const session::VeltradSession& session) {
   const std::int32_t clientType = session.clientType().value_or(0);
   logDebug("storebagForSession: Retrieving storebag for session %u with client type %d", session.sessionID(),
            clientType);

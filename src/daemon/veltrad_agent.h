@@ -28,7 +28,8 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   bool listener(ipc::Listener& listener,
                 const std::shared_ptr<ipc::Connection>& shouldAcceptNewConnection) override;
 
-  std::shared_ptr<const Dictionary> storebagForSession(const session::VeltradSession& session) override;
+  std::shared_ptr<const config::StorebagSection> storebagForSession(
+      const session::VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const session::VeltradSession& session) override;
   void sessionInfoUpdated(session::FamilyFacts facts) override {
     _families.sessionInfoUpdated(std::move(facts));

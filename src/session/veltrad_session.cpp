@@ -99,7 +99,7 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", _sessionID);
-  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
@@ -114,7 +114,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
+void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", _sessionID);
   // It may have been out of reach when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
@@ -315,7 +315,7 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   _sessionInfo = kept;
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
-  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::no_storebag);
     if (reply) reply("storebag not available");

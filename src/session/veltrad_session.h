@@ -88,7 +88,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
-  void createBackendsWithStorebag(const Dictionary& storebag);
+  void createBackendsWithStorebag(const config::StorebagSection& storebag);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
   void receivedUserInfo(backends::SharedDictionary userInfo);

@@ -43,7 +43,7 @@ struct Client final : ipc::Connection {
 };
 
 struct Reporting final : backends::VeltraBackend {
-  Reporting(const char* name, platform::Random& random) : VeltraBackend(name, {}, "", random) {}
+  Reporting(const char* name, platform::Random& random) : VeltraBackend(name, "", random) {}
 };
 
 // "A0": ID A, level 0. Then, in any order: "@name" another client than "phone", "!" aggregates, "=1" its back
