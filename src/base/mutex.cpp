@@ -15,16 +15,13 @@ struct Held {
 thread_local Held held;
 }  // namespace
 
-void taking(LockRank rank, bool recursive) {
+void taking(LockRank rank) {
   const int wanted = static_cast<int>(rank);
   int highest = 0;
-  bool again = false;
   for (int i = 0; i < held.count; ++i) {
     if (held.ranks[i] > highest) highest = held.ranks[i];
-    if (held.ranks[i] == wanted) again = true;
   }
-  const bool allowed = wanted > highest || (recursive && again);
-  if (!allowed || held.count == kMostHeld) {
+  if (wanted <= highest || held.count == kMostHeld) {
     std::fprintf(stderr, "lock order: a lock of rank %d is wanted while one of rank %d is held\n", wanted,
                  highest);
     std::abort();

@@ -59,7 +59,7 @@ LOCK_LEVELS(60, 50);
 
 namespace lock_order {
 // Debug builds: aborts with both ranks when `rank` may not be taken now. Release builds: nothing.
-void taking(LockRank rank, bool recursive);
+void taking(LockRank rank);
 void released(LockRank rank);
 }  // namespace lock_order
 
@@ -71,7 +71,7 @@ class CAPABILITY("mutex") Mutex {
 
   void lock() ACQUIRE() {
 #ifndef NDEBUG
-    lock_order::taking(_rank, false);
+    lock_order::taking(_rank);
 #endif
     _mutex.lock();
   }
@@ -88,45 +88,16 @@ class CAPABILITY("mutex") Mutex {
   [[maybe_unused]] const LockRank _rank;  // of use in debug builds alone
 };
 
-// The same thread may take it again. Analysed like a Mutex: a function that may hold it already says so with
-// REQUIRES and does not take it.
-class CAPABILITY("mutex") RecursiveMutex {
- public:
-  explicit RecursiveMutex(LockRank rank) : _rank(rank) {}
-  RecursiveMutex(const RecursiveMutex&) = delete;
-  RecursiveMutex& operator=(const RecursiveMutex&) = delete;
-
-  void lock() ACQUIRE() {
-#ifndef NDEBUG
-    lock_order::taking(_rank, true);
-#endif
-    _mutex.lock();
-  }
-  void unlock() RELEASE() {
-    _mutex.unlock();
-#ifndef NDEBUG
-    lock_order::released(_rank);
-#endif
-  }
-
- private:
-  std::recursive_mutex _mutex;
-  [[maybe_unused]] const LockRank _rank;  // of use in debug builds alone
-};
-
-template <typename M>
 class SCOPED_CAPABILITY Lock {
  public:
-  explicit Lock(M& mutex) ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
+  explicit Lock(Mutex& mutex) ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
   ~Lock() RELEASE() { _mutex.unlock(); }
   Lock(const Lock&) = delete;
   Lock& operator=(const Lock&) = delete;
 
  private:
-  M& _mutex;
+  Mutex& _mutex;
 };
-template <typename M>
-Lock(M&) -> Lock<M>;
 
 // Waits for a condition under a Mutex; always in a loop around the condition, or with wait_until's predicate.
 class Condition {
@@ -149,16 +120,6 @@ class Condition {
 
  private:
   std::condition_variable _condition;
-};
-
-// The same for a RecursiveMutex that the thread holds exactly once; always in a loop around the condition.
-class RecursiveCondition {
- public:
-  void wait(RecursiveMutex& mutex) REQUIRES(mutex) { _condition.wait(mutex); }
-  void notifyAll() { _condition.notify_all(); }
-
- private:
-  std::condition_variable_any _condition;
 };
 
 }  // namespace veltrad

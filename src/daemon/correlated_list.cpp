@@ -1,79 +1,64 @@
 // Looking up sessions by their level.
 #include "daemon/correlated_list.h"
 
-#include <utility>
+#include <algorithm>
+#include <limits>
 
 namespace veltrad::daemon {
 
-void CorrelatedList::join(const SessionPointer& session) {
-  const Place place{session->getSessionHierarchy(), _nextJoined};
-  if (!_places.emplace(session.get(), place).second) return;
-  ++_nextJoined;
-  _levels[place.level].emplace(place.joined, session);
+void CorrelatedList::join(FamilyMember& member) {
+  member.joined = _nextJoined++;
+  member.level = session::hierarchyOf(member.facts.backends.get());
+  _members.emplace(std::pair(member.level, member.joined), &member);
 }
 
-void CorrelatedList::leave(const session::VeltradSession& session) {
-  const auto at = _places.find(&session);
-  if (at == _places.end()) return;
-  const SessionPointer kept = take(at->second);  // may be the last reference
-  _places.erase(at);
+void CorrelatedList::leave(const FamilyMember& member) {
+  _members.erase({member.level, member.joined});
 }
 
-void CorrelatedList::refreshLevel(const session::VeltradSession& session) {
-  const auto at = _places.find(&session);
-  const std::int32_t level = session.getSessionHierarchy();
-  if (at == _places.end() || at->second.level == level) return;
-  SessionPointer moved = take(at->second);
-  at->second.level = level;
-  _levels[level].emplace(at->second.joined, std::move(moved));
+void CorrelatedList::refreshLevel(FamilyMember& member) {
+  auto moved = _members.extract({member.level, member.joined});
+  member.level = session::hierarchyOf(member.facts.backends.get());
+  if (moved.empty()) return;
+  moved.key().first = member.level;
+  _members.insert(std::move(moved));
 }
 
-CorrelatedList::SessionPointer CorrelatedList::take(const Place& place) {
-  const auto level = _levels.find(place.level);
-  SessionPointer taken = std::move(level->second.extract(place.joined).mapped());
-  if (level->second.empty()) _levels.erase(level);
-  return taken;
+const FamilyMember* CorrelatedList::getFirstSessionWithHierarchy(std::int64_t hierarchy) const {
+  const auto first = _members.lower_bound({hierarchy, 0});
+  return first == _members.end() || first->first.first != hierarchy ? nullptr : first->second;
 }
 
-CorrelatedList::SessionPointer CorrelatedList::getFirstSessionWithHierarchy(std::int64_t hierarchy) const {
-  const auto level = _levels.find(hierarchy);
-  return level == _levels.end() ? nullptr : level->second.begin()->second;
-}
-
-CorrelatedList::SessionPointer CorrelatedList::topmostAggregator(std::int32_t hierarchy) const {
-  for (auto level = _levels.lower_bound(0); level != _levels.end() && level->first < hierarchy; ++level) {
-    const SessionPointer& first = level->second.begin()->second;
-    if (first->hasAggregator()) return first;
+const FamilyMember* CorrelatedList::topmostAggregator(std::int32_t hierarchy) const {
+  auto first = _members.lower_bound({0, 0});
+  while (first != _members.end() && first->first.first < hierarchy) {
+    if (first->second->facts.aggregation->active()) return first->second;
+    first = _members.lower_bound({first->first.first + 1, 0});
   }
   return nullptr;
 }
 
 AncestorIDs CorrelatedList::ancestorIDs(std::int32_t hierarchy) const {
-  std::vector<const std::string*> upwards;
-  std::int32_t level = hierarchy - 1;
-  for (; level >= 0; --level) {
-    const auto found = _levels.find(level);
-    if (found == _levels.end()) break;
-    upwards.push_back(&found->second.begin()->second->sessionIDString());
-  }
   AncestorIDs ids;
-  ids.complete = level < 0;
-  for (auto id = upwards.rbegin(); id != upwards.rend(); ++id) {
-    if (!ids.text.empty()) ids.text += '.';
-    ids.text += **id;
+  for (std::int64_t level = std::int64_t{hierarchy} - 1; level >= 0; --level) {
+    const FamilyMember* ancestor = getFirstSessionWithHierarchy(level);
+    if (!ancestor) {
+      ids.complete = false;
+      break;
+    }
+    ids.text = ancestor->facts.sessionIDString + (ids.text.empty() ? "" : "." + ids.text);
   }
   return ids;
 }
 
-std::vector<CorrelatedList::SessionPointer> CorrelatedList::below(std::int32_t hierarchy) const {
-  std::map<std::uint64_t, SessionPointer> found;
-  for (auto level = _levels.upper_bound(hierarchy); level != _levels.end(); ++level) {
-    found.insert(level->second.begin(), level->second.end());
-  }
-  std::vector<SessionPointer> sessions;
-  sessions.reserve(found.size());
-  for (auto& [joined, session] : found) sessions.push_back(std::move(session));
-  return sessions;
+std::vector<const FamilyMember*> CorrelatedList::below(std::int32_t hierarchy) const {
+  const auto begin = _members.upper_bound({hierarchy, std::numeric_limits<std::uint64_t>::max()});
+  std::vector<const FamilyMember*> members;
+  std::transform(begin, _members.end(), std::back_inserter(members),
+                 [](const auto& at) { return at.second; });
+  std::sort(members.begin(), members.end(),
+            [](const FamilyMember* a, const FamilyMember* b) { return a->joined < b->joined; });
+  return members;
 }
 
 }  // namespace veltrad::daemon

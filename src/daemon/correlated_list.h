@@ -1,15 +1,16 @@
 // Sessions that share a user-info key, in the order of joining, with an index of their levels. Under the
-// agent's lock.
+// families' lock.
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
-#include <memory>
+#include <memory_resource>
 #include <string>
-#include <unordered_map>
+#include <utility>
 #include <vector>
 
-#include "session/veltrad_session.h"
+#include "session/session_delegate.h"
 
 namespace veltrad::daemon {
 
@@ -21,39 +22,40 @@ struct AncestorIDs {
   bool complete = true;
 };
 
-// A session's level is its hierarchy number (getSessionHierarchy) at the time of join() or refreshLevel():
-// the registry refreshes it whenever the session's states were recomputed.
+struct FamilyMember;
+
+// Members outlive their time in it.
 class CorrelatedList {
  public:
-  using SessionPointer = std::shared_ptr<session::VeltradSession>;
-
-  void join(const SessionPointer& session);  // at the end, unless it is in already
-  void leave(const session::VeltradSession& session);
-  void refreshLevel(const session::VeltradSession& session);
-  bool contains(const session::VeltradSession& session) const { return _places.count(&session) > 0; }
-  bool empty() const { return _places.empty(); }
+  void join(FamilyMember& member);  // at the end; it is in none
+  void leave(const FamilyMember& member);
+  void refreshLevel(FamilyMember& member);
+  bool empty() const { return _members.empty(); }
 
   // The first that joined of those with this hierarchy number, or null.
-  SessionPointer getFirstSessionWithHierarchy(std::int64_t hierarchy) const;
+  const FamilyMember* getFirstSessionWithHierarchy(std::int64_t hierarchy) const;
   // The first of each level from 0 to `hierarchy` - 1, from the root down: the first of these that
   // aggregates, or null.
-  SessionPointer topmostAggregator(std::int32_t hierarchy) const;
+  const FamilyMember* topmostAggregator(std::int32_t hierarchy) const;
   AncestorIDs ancestorIDs(std::int32_t hierarchy) const;
   // Those with a greater hierarchy number, in the order of joining.
-  std::vector<SessionPointer> below(std::int32_t hierarchy) const;
+  std::vector<const FamilyMember*> below(std::int32_t hierarchy) const;
 
  private:
-  // In the order of joining; never empty.
-  using Level = std::map<std::uint64_t, SessionPointer>;
-  struct Place {
-    std::int32_t level;
-    std::uint64_t joined;
-  };
-  SessionPointer take(const Place& place);
-
   std::uint64_t _nextJoined = 0;
-  std::unordered_map<const session::VeltradSession*, Place> _places;
-  std::map<std::int64_t, Level> _levels;
+  std::map<std::pair<std::int64_t, std::uint64_t>, const FamilyMember*> _members;  // by level, then joining
+};
+
+using CorrelatedLists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;  // by user-info key
+
+// A session as its family knows it.
+struct FamilyMember {
+  session::FamilyFacts facts;      // that it told last
+  std::string key;                 // of the user info in them
+  CorrelatedLists::iterator home;  // the one list that it is in
+  // That list's alone. The level is the hierarchy number at the last refreshLevel().
+  std::int32_t level = 0;
+  std::uint64_t joined = 0;
 };
 
 }  // namespace veltrad::daemon

@@ -2,6 +2,7 @@
 #include "daemon/storebag_cache.h"
 
 #include <cmath>
+#include <new>
 
 #include "config/client_types.h"
 #include "config/storebag_content.h"
@@ -18,81 +19,91 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
   return age < kSecondsBetweenAttempts ? CacheVerdict::wait : CacheVerdict::fetch;
 }
 
-std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType,
-                                                                                    RecursiveMutex& lock) {
+// What one exchange brings.
+struct StorebagCache::Download {
+  std::optional<std::string> lastModified = std::nullopt;
+  std::int32_t maxAge = 0;
+  std::optional<std::string> version = std::nullopt;
+  bool notModified = false;
+  bool attempted = true;
+  std::shared_ptr<const config::StorebagSection> section = nullptr;
+};
+
+std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
-  if (!name) return fetchAndCacheStorebag(clientType, nullptr, lock);
-  for (;;) {
-    const auto at = _cachedStorebags.find(name);
-    if (at == _cachedStorebags.end()) break;
-    if (at->second.beingFetched) {
-      _fetched.wait(lock);
-      continue;
-    }
-    const CacheVerdict verdict = verdictOfRecord(at->second, platform::timevalToSeconds(_clock.now()));
+  Download download;
+  if (name) {
+    const Lock held(_lock);
+    StorebagRecord& record = settledRecord(name);
+    const CacheVerdict verdict = verdictOfRecord(record, platform::timevalToSeconds(_clock.now()));
     if (verdict == CacheVerdict::serve) {
       logDebug("storebagForSession: Cached storebag found for client type %d", clientType);
-      return at->second.data;
+      return record.data;
     }
     if (verdict == CacheVerdict::wait) {
       logInfo(
           "storebagForSession: Not fetching storebag for client type %d - must wait %d seconds between "
           "attempts",
           clientType, kSecondsBetweenAttempts);
-      return at->second.data;
+      return record.data;
     }
-    break;
+    download.lastModified = record.lastModified;
+    record.beingFetched = true;
   }
-  return fetchAndCacheStorebag(clientType, name, lock);
+  logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
+  try {
+    download.section = _source.fetchStorebagForEnvironmentAndClientType(
+        clientType, download.maxAge, download.version, download.notModified, &download.lastModified,
+        download.attempted);
+  } catch (const std::bad_alloc&) {
+    const Lock held(_lock);
+    if (name) settle(_cachedStorebags[name]);
+    throw;
+  }
+  if (!name) return nullptr;
+  const Lock held(_lock);
+  return taken(clientType, _cachedStorebags[name], std::move(download));
 }
 
-std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) const {
+std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
+  const Lock held(_lock);
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
 }
 
-std::shared_ptr<const config::StorebagSection> StorebagCache::fetchAndCacheStorebag(std::int32_t clientType,
-                                                                                    const char* name,
-                                                                                    RecursiveMutex& lock) {
-  logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
-  std::int32_t maxAge = 0;
-  std::optional<std::string> version;
-  bool notModified = false;
-  bool attempted = true;
-  if (!name) {
-    std::optional<std::string> lastModified;
-    _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified, &lastModified,
-                                                     attempted);
-    return nullptr;
-  }
-  std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
-  _cachedStorebags[name].beingFetched = true;
-  lock.unlock();
-  auto section = _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified,
-                                                                  &lastModified, attempted);
-  lock.lock();
-
-  StorebagRecord& record = _cachedStorebags[name];
+void StorebagCache::settle(StorebagRecord& record) {
   record.beingFetched = false;
   _fetched.notifyAll();
-  if (!attempted) {
+}
+
+StorebagRecord& StorebagCache::settledRecord(const std::string& name) {
+  StorebagRecord& record = _cachedStorebags[name];
+  while (record.beingFetched) _fetched.wait(_lock);
+  return record;
+}
+
+std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t clientType,
+                                                                    StorebagRecord& record,
+                                                                    Download download) {
+  settle(record);
+  if (!download.attempted) {
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    return record.data ? record.data : section;
+    return record.data ? record.data : download.section;
   }
-  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
-  record.fetchSuccessful = section != nullptr || notModified;
-  if (section) {
-    record.data = std::move(section);
-    record.version = std::move(version);
-  } else if (!notModified) {
+  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", download.maxAge);
+  record.fetchSuccessful = download.section != nullptr || download.notModified;
+  if (download.section) {
+    record.data = std::move(download.section);
+    record.version = std::move(download.version);
+  } else if (!download.notModified) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
   }
   record.fetchTime = platform::timevalToSeconds(_clock.now());
-  record.maxAge = maxAge;
-  if (lastModified) record.lastModified = std::move(lastModified);
+  record.maxAge = download.maxAge;
+  if (download.lastModified) record.lastModified = std::move(download.lastModified);
   record.attempted = true;
   return record.data;
 }

@@ -1,5 +1,4 @@
-// The storebags that the daemon holds, one record a name. Under the agent's lock, which is let go for the
-// exchange with the server alone.
+// The storebags that the daemon holds, one record a name. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -8,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "base/mutex.h"
+#include "daemon/lock_ranks.h"
 
 namespace veltrad::config {
 class StorebagSource;
@@ -47,22 +46,28 @@ class StorebagCache {
   StorebagCache(config::StorebagSource& source, const platform::Clock& clock)
       : _source(source), _clock(clock) {}
 
-  // `lock` is the agent's, held by every caller. The section for the client type, or null: may wait for an
-  // exchange, with the lock let go, so the lock is held exactly once when it is called.
-  std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType,
-                                                                       RecursiveMutex& lock) REQUIRES(lock);
-  std::optional<std::string> versionForClientType(std::int32_t clientType) const;
+  // The section for the client type, or null. May wait for an exchange with the server, its own or another's
+  // for the same name, without the lock.
+  std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
+  std::optional<std::string> versionForClientType(std::int32_t clientType);
 
  private:
+  struct Download;
+
+  // Nobody fetches it any more.
+  void settle(StorebagRecord& record) REQUIRES(_lock);
+  // The record of this name, once nobody fetches it.
+  StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
   // What the session gets.
-  std::shared_ptr<const config::StorebagSection> fetchAndCacheStorebag(std::int32_t clientType,
-                                                                       const char* name, RecursiveMutex& lock)
-      REQUIRES(lock);
+  std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,
+                                                       Download download) REQUIRES(_lock);
 
   config::StorebagSource& _source;
   const platform::Clock& _clock;
-  RecursiveCondition _fetched;
-  std::map<std::string, StorebagRecord> _cachedStorebags;
+
+  Mutex _lock STOREBAG_CACHE_LOCK;
+  Condition _fetched;
+  std::map<std::string, StorebagRecord> _cachedStorebags GUARDED_BY(_lock);
 };
 
 }  // namespace veltrad::daemon

@@ -9,7 +9,6 @@
 
 #include "base/value.h"
 #include "wire/client_session_interface.h"
-#include "wire/client_session_reply_interface.h"
 
 namespace veltrad::platform {
 class MemoryAccount;
@@ -20,8 +19,7 @@ namespace veltrad::ipc {
 class Listener;
 
 // Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's
-// own thread reads frames and runs calls and handlers, one at a time. remoteObjectProxyWithErrorHandler: any
-// thread.
+// own thread reads frames and runs calls and handlers, one at a time. sendEvent: any thread.
 class Connection {
  public:
   virtual ~Connection() = default;
@@ -37,10 +35,9 @@ class Connection {
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   virtual void resume() = 0;
 
-  // The client's object. A call on it never blocks; when it fails (the client has gone, or its queue is full)
-  // the handler gets the error's description, on the calling thread, inside that call.
-  virtual std::shared_ptr<wire::ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
-      std::function<void(const std::string&)> handler) = 0;
+  // A frame of client_events.h. Never blocks, and takes a leaf lock alone. Why it was dropped (the client has
+  // gone, or its queue is full), or nothing.
+  virtual std::optional<std::string> sendEvent(std::string_view frame) = 0;
 };
 
 class ListenerDelegate {

@@ -8,8 +8,8 @@
 #include <cerrno>
 #include <new>
 
+#include "ipc/client_events.h"
 #include "ipc/dispatcher.h"
-#include "ipc/remote_object.h"
 #include "platform/log.h"
 #include "wire/names.h"
 
@@ -55,9 +55,8 @@ std::optional<Value> SocketConnection::valueForEntitlement(std::string_view name
   return _entitlements.valueForEntitlement(name, _peer);
 }
 
-std::shared_ptr<wire::ClientSessionReplyInterface> SocketConnection::remoteObjectProxyWithErrorHandler(
-    std::function<void(const std::string&)> handler) {
-  return std::make_shared<RemoteObject>(_out, std::move(handler));
+std::optional<std::string> SocketConnection::sendEvent(std::string_view frame) {
+  return ipc::sendEvent(*_out, frame);
 }
 
 void SocketConnection::run() {

@@ -19,7 +19,7 @@ namespace veltrad::ipc {
 
 // Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
 // the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
-// and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, lent files and
+// and sendEvent() may be called by any thread. Entitlements, lent files and
 // counters outlive it. A session and its connection hold each other until run() returns.
 //
 // Its 17 fields are the services that a call may need, what the delegate has set, and how far the
@@ -57,8 +57,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
     _invalidationHandler = std::move(handler);
   }
   void resume() override { _resumed = true; }
-  std::shared_ptr<wire::ClientSessionReplyInterface> remoteObjectProxyWithErrorHandler(
-      std::function<void(const std::string&)> handler) override;
+  std::optional<std::string> sendEvent(std::string_view frame) override;
 
  private:
   void serve();

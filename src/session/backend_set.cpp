@@ -68,4 +68,28 @@ std::vector<std::string> reportingNames(const BackendSet& backends) {
   return names;
 }
 
+std::int32_t hierarchyOf(const BackendSet* backends) {
+  if (!backends) return 0;
+  for (const char* name : {wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendHTTPPost}) {
+    const auto at = backends->find(name);
+    if (at != backends->end()) return at->second->hierarchy();
+  }
+  return 0;
+}
+
+void syncReportingStates(const BackendSet& backends, const BackendSet* parents) {
+  for (const auto& [name, backend] : backends) {
+    if (backend->state() == backends::kBackendHeld) continue;
+    const auto at = parents ? parents->find(name) : BackendSet::const_iterator();
+    if (!parents || at == parents->end()) {
+      backend->setState(backends::kBackendDisabled);
+      continue;
+    }
+    backend->setState(at->second->state());
+    backend->setSamplingThreshold(at->second->samplingThreshold());
+    logDebug("HTTPSPostBackend(syncReportingStates): %s: state and sampling rate updated to %d, %.02f%%",
+             backend->name().c_str(), backend->state(), backend->samplingThreshold().value_or(0));
+  }
+}
+
 }  // namespace veltrad::session

@@ -1,6 +1,8 @@
-// The backends of one session, made from a storebag section. Plain functions; the session's thread.
+// The backends of one session, made from a storebag section. Plain functions; the session's thread, but for
+// what a family does.
 #pragma once
 
+#include <cstdint>
 #include <map>
 #include <memory>
 #include <string>
@@ -51,5 +53,14 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
 
 // The names of those in state 2 or 3.
 std::vector<std::string> reportingNames(const BackendSet& backends);
+
+// The number that the HTTPS post backend takes from its client entry; 0, a root, also without one. Any
+// thread.
+std::int32_t hierarchyOf(const BackendSet* backends);
+
+// Takes over the states and sampling thresholds of the parent session's back ends, one by one; one in state 3
+// keeps its own, one that the parent lacks is disabled. Any thread, one at a time for all sessions of a
+// family.
+void syncReportingStates(const BackendSet& backends, const BackendSet* parents);
 
 }  // namespace veltrad::session

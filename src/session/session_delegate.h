@@ -2,18 +2,35 @@
 // thread.
 #pragma once
 
-#include <functional>
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
-namespace veltrad::config {
-struct StorebagSection;
-}  // namespace veltrad::config
+#include "session/aggregation.h"
+#include "session/backend_set.h"
 
 namespace veltrad::session {
 
 class VeltradSession;
+
+// What a session tells its family of itself.
+struct FamilyFacts {
+  std::shared_ptr<Aggregation>
+      aggregation;  // never null, and no other session's: the families know it by this
+  std::uint32_t sessionID = 0;
+  std::string sessionIDString;
+  backends::SharedDictionary userInfo;         // null: none
+  std::shared_ptr<const BackendSet> backends;  // null: none
+};
+
+// Where a session is in its family, as it knows itself.
+struct FamilyPlace {
+  const Aggregation& aggregation;
+  backends::SharedDictionary userInfo;  // null: none
+  std::int32_t hierarchy;
+};
 
 class VeltradSessionDelegate {
  public:
@@ -24,23 +41,19 @@ class VeltradSessionDelegate {
       const VeltradSession& session) = 0;
   // Never downloads.
   virtual std::optional<std::string> storebagVersionForSession(const VeltradSession& session) = 0;
-  // Runs `change` under the registry's lock: a session that changes its user info and joins another list in
-  // it is never seen between two.
-  virtual void changeIdentity(const std::function<void()>& change) = 0;
-  // The session joins the list of its user-info key, leaving any other.
-  virtual void userInfoUpdatedForSession(const std::shared_ptr<VeltradSession>& session) = 0;
-  // The ID strings of the session's ancestors from the root to its parent, joined by "."; from the gap on
-  // where one is missing; none for a root and where the parent is missing.
-  virtual std::optional<std::string> parentSessionIDStringForSession(const VeltradSession& session) = 0;
-  // The first session of the same key that is one level up. Only inside updateDownstreamSessions, which holds
-  // the registry's lock.
-  virtual std::shared_ptr<VeltradSession> parentSessionForChild(const VeltradSession& session) = 0;
-  // Calls `use` with the topmost ancestor that aggregates, under the registry's lock, so that it stays what
-  // it is; false, and no call, when there is none. `use` never blocks.
-  virtual bool withAncestorAggregator(const VeltradSession& session,
-                                      const std::function<void(VeltradSession&)>& use) = 0;
-  // Refreshes the session and every session below it.
-  virtual void updateDownstreamSessions(const std::shared_ptr<VeltradSession>& session) = 0;
+
+  // The families keep the facts of the last call, if the session is in one.
+  virtual void sessionInfoUpdated(FamilyFacts facts) = 0;
+  // The session joins the list of its user-info key, leaving any other in the same step.
+  virtual void userInfoUpdatedForSession(FamilyFacts facts) = 0;
+  // Gives the back ends of the session and of every session below it their combined IDs and their parents'
+  // states.
+  virtual void updateDownstreamSessions(FamilyFacts facts) = 0;
+  // Whether an ancestor aggregates now, so that a copy is worth making.
+  virtual bool ancestorAggregates(const FamilyPlace& place) = 0;
+  // Queues a copy for the topmost ancestor that aggregates by now, if there is one.
+  virtual CopySent sendToAncestor(const FamilyPlace& place, std::string_view copy) = 0;
+
   // For log lines.
   virtual std::string description() const = 0;
 };

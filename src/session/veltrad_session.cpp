@@ -1,4 +1,4 @@
-// A session's life: creation, configuration, start, state queries, the end.
+// A session's life and its messages: creation, configuration, start, state queries, routing, the end.
 #include "session/veltrad_session.h"
 
 #include <fmt/format.h>
@@ -9,6 +9,8 @@
 #include "platform/log.h"
 #include "platform/uuid.h"
 #include "session/kept_info.h"
+#include "session/one_shot.h"
+#include "session/routing.h"
 #include "session/session_delegate.h"
 #include "session/start_message.h"
 #include "support/device_identity.h"
@@ -46,8 +48,8 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
     : _services(services),
       _sessionDelegate(delegate),
       _sessionIDString(std::move(sessionIDString)),
-      _account(connection ? connection->memoryAccount() : nullptr),
-      _connection(std::move(connection)) {
+      _account(connection->memoryAccount()),
+      _aggregation(std::make_shared<Aggregation>(std::move(connection))) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
 
@@ -57,33 +59,12 @@ std::string VeltradSession::description() const {
   return fmt::format("<VeltradSession: {}>", fmt::ptr(this));
 }
 
-std::optional<std::string> VeltradSession::storebagVersion() const {
-  const Lock held(_mutex);
-  return _storebagVersion;
-}
-
-backends::SharedDictionary VeltradSession::sessionInfo() const {
-  const Lock held(_mutex);
-  return _sessionInfo;
-}
-
-backends::SharedDictionary VeltradSession::userInfo() const {
-  const Lock held(_mutex);
-  return _userInfo;
-}
-
-std::shared_ptr<const BackendSet> VeltradSession::backends() const {
-  const Lock held(_mutex);
-  return _backends;
-}
-
-std::string VeltradSession::deviceID() const {
-  return _deviceid;
+FamilyFacts VeltradSession::familyFacts() const {
+  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends};
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {
-  const backends::SharedDictionary info = sessionInfo();
-  return info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
+  return _sessionInfo ? _sessionInfo->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
 }
 
 bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
@@ -91,16 +72,16 @@ bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::
   backends::SharedDictionary info;
   backends::SharedDictionary identity;
   if (!charged(std::move(sessionInfo), info) || !charged(std::move(userInfo), identity)) return false;
-  const std::uint32_t number = info ? info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0) : 0;
-  _sessionID.store(number, std::memory_order_relaxed);
-  logDebug("setSessionInfo: Configuring session %u", number);
+  _sessionID = info ? info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0) : 0;
+  logDebug("setSessionInfo: Configuring session %u", _sessionID);
   const bool required = info && info->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
   if (identity && !required) {
     logWarning("setSessionInfo: Configure session: user info provided without requiring it");
   }
-  keepSessionInfo(std::move(info));
+  _sessionInfo = std::move(info);
   keepUserInfo(std::move(identity));
-  _hasAggregator.store(hasAggregationBlock, std::memory_order_relaxed);
+  _aggregation->setActive(hasAggregationBlock);
+  _sessionDelegate.sessionInfoUpdated(familyFacts());
   return true;
 }
 
@@ -111,132 +92,93 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
   return kept != nullptr;
 }
 
-void VeltradSession::keepSessionInfo(backends::SharedDictionary info) {
-  const Lock held(_mutex);
-  _sessionInfo.swap(info);
-}
-
 void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
-  const Lock held(_mutex);
-  _userInfo.swap(info);
+  _userInfo = std::move(info);
 }
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
-  logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
+  logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", _sessionID);
   const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
     return;
   }
-  auto version = _sessionDelegate.storebagVersionForSession(*this);
-  {
-    const Lock held(_mutex);
-    _storebagVersion = std::move(version);
-  }
+  _storebagVersion = _sessionDelegate.storebagVersionForSession(*this);
   createBackendsWithStorebag(*storebag);
   updateSessionWithDefaultSessionInfo();
-  sendStartMessage();
+  internalSendMessage(
+      startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
+      0);
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
 void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
-  logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
-  const backends::SharedDictionary info = sessionInfo();
+  logDebug("createBackendsWithStorebag: Creating backends for session %u", _sessionID);
   // It may have been out of reach when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
   auto made =
       createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
-                     &storebag, info.get(), userInfo(), deviceID());
+                     &storebag, _sessionInfo.get(), _userInfo, _deviceid);
   if (made) {
     for (const auto& [name, backend] : *made) backend->setCombinedSessionIDString(_sessionIDString);
   }
-  {
-    const Lock held(_mutex);
-    _backends.swap(made);
-  }
+  _backends.swap(made);
   // A second start: what it replaced is let go in order.
   if (made) {
     for (const auto& [name, backend] : *made) backend->cleanup();
   }
 }
 
-void VeltradSession::sendStartMessage() {
-  internalSendMessage(
-      startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
-      0);
-}
-
 void VeltradSession::updateSessionWithDefaultSessionInfo() {
-  _sessionDelegate.userInfoUpdatedForSession(shared_from_this());
-  refreshStates();
-}
-
-void VeltradSession::refreshStates() {
-  updateReportingStates();
-  _sessionDelegate.updateDownstreamSessions(shared_from_this());
-}
-
-void VeltradSession::updateReportingStates() {
-  if (const auto set = backends()) {
-    for (const auto& [name, backend] : *set) backend->updateState();
+  _sessionDelegate.userInfoUpdatedForSession(familyFacts());
+  if (_backends) {
+    for (const auto& [name, backend] : *_backends) backend->updateState();
   }
-}
-
-void VeltradSession::updateUserInfoForBackends() {
-  const backends::SharedDictionary info = userInfo();
-  if (const auto set = backends()) {
-    for (const auto& [name, backend] : *set) backend->setUserInfoDict(info);
-  }
+  _sessionDelegate.updateDownstreamSessions(familyFacts());
 }
 
 std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
-  const auto set = backends();
-  if (!set) return std::nullopt;
-  return reportingNames(*set);
+  if (!_backends) return std::nullopt;
+  return reportingNames(*_backends);
 }
 
 void VeltradSession::fetchStatesWithUserInfo(wire::OptionalDictionary userInfo,
                                              wire::NamesReply completionHandler) {
-  logDebug("fetchStatesWithUserInfo: Fetching states for session %u", sessionID());
+  logDebug("fetchStatesWithUserInfo: Fetching states for session %u", _sessionID);
   backends::SharedDictionary identity;
   if (charged(std::move(userInfo), identity)) receivedUserInfo(std::move(identity));
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
 void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
-  const backends::SharedDictionary current = userInfo();
+  const backends::SharedDictionary current = _userInfo;
   if (!updated) {
     if (!current) return;
-    const backends::SharedDictionary info = sessionInfo();
-    if (info && info->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) return;
+    if (_sessionInfo && _sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false))
+      return;
   }
   const bool unchanged = current && updated &&
                          sameName(*current, *updated, wire::kVeltraUserInfoClientName) &&
                          sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
-  const auto take = [this, &updated] {
-    keepUserInfo(std::move(updated));
-    updateUserInfoForBackends();
-  };
-  if (unchanged) return take();
-  const auto self = shared_from_this();
-  _sessionDelegate.changeIdentity([&] {
-    take();
-    logDebug("receivedUserInfo: Received new user info for session %u", sessionID());
-    _sessionDelegate.userInfoUpdatedForSession(self);
-  });
-  refreshStates();
+  keepUserInfo(std::move(updated));
+  if (_backends) {
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
+  }
+  if (unchanged) return _sessionDelegate.sessionInfoUpdated(familyFacts());
+  logDebug("receivedUserInfo: Received new user info for session %u", _sessionID);
+  updateSessionWithDefaultSessionInfo();
 }
 
 void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
-  logDebug("fetchDisplayURL: Fetching display URL for session %u", sessionID());
+  logDebug("fetchDisplayURL: Fetching display URL for session %u", _sessionID);
   std::string url = "URL not available";
-  if (const auto set = backends()) {
+  if (_backends) {
     for (const char* name :
          {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendDashboard}) {
-      const auto at = set->find(name);
-      const auto display = at == set->end() ? std::nullopt : at->second->displayURL();
+      const auto at = _backends->find(name);
+      const auto display = at == _backends->end() ? std::nullopt : at->second->displayURL();
       if (!display) continue;
       url = *display;
       break;
@@ -245,72 +187,161 @@ void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
   if (reply) reply(url);
 }
 
-std::int32_t VeltradSession::getSessionHierarchy() const {
-  const auto set = backends();
-  if (!set) return 0;
-  for (const char* name : {wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendHTTPPost}) {
-    const auto at = set->find(name);
-    if (at != set->end()) return at->second->hierarchy();
-  }
-  return 0;
+void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                             wire::OptionalDictionary payload, wire::StringReply reply) {
+  logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
+  const auto answer = sendMessageWithCategory(category, type, std::move(payload));
+  if (reply) reply(answer);
 }
 
-void VeltradSession::syncReportingStates() {
-  const auto mine = backends();
-  const auto parent = _sessionDelegate.parentSessionForChild(*this);
-  const auto theirs = parent ? parent->backends() : nullptr;
-  if (!mine) return;
-  for (const auto& [name, backend] : *mine) {
-    if (!parent) {
-      if (backend->hierarchy() >= 1) {
-        logInfo("syncReportingStates: child session %u (backend %s) with hierarchy %d is missing its parent",
-                sessionID(), backend->name().c_str(), backend->hierarchy());
-      }
-      continue;
-    }
-    if (backend->state() == backends::kBackendHeld) continue;
-    const auto at = theirs ? theirs->find(name) : BackendSet::const_iterator();
-    if (!theirs || at == theirs->end()) {
-      backend->setState(backends::kBackendDisabled);
-      continue;
-    }
-    backend->setState(at->second->state());
-    backend->setSamplingThreshold(at->second->samplingThreshold());
-    logDebug("HTTPSPostBackend(syncReportingStates): %s: state and sampling rate updated to %d, %.02f%%",
-             backend->name().c_str(), backend->state(), backend->samplingThreshold().value_or(0));
-  }
+void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::StringReply reply) {
+  logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
+  const auto answer = sendMessageWithDictionary(message, Origin::client);
+  if (reply) reply(answer);
 }
 
-void VeltradSession::updateCombinedSessionID() {
-  const auto ancestors = _sessionDelegate.parentSessionIDStringForSession(*this);
-  if (!ancestors) return;
-  const std::string combined = *ancestors + "." + _sessionIDString;
-  logDebug("updateCombinedSessionID: Updating combined session ID '%s' for session %u backends",
-           combined.c_str(), sessionID());
-  if (const auto set = backends()) {
-    for (const auto& [name, backend] : *set) backend->setCorrelatedSessionID(combined);
+void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
+  logDebug("finishSessionWithReply: Finishing session %u", _sessionID);
+  const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
+  if (reply) reply(answer);
+}
+
+std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
+                                                                   wire::OptionalDictionary payload,
+                                                                   Origin origin) {
+  Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
+                     {wire::kVeltraMessageParametersFlag, 0u},
+                     {wire::kVeltraMessageParametersType, unsigned{type}}};
+  if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
+  return sendMessageWithDictionary(message, origin);
+}
+
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
+                                                                     Origin origin) {
+  if (!_backends) {
+    logDebug("sendMessageWithDictionary: No backends available to send message");
+    if (origin == Origin::client) {
+      _services.counters.count(wire::Reason::no_backends);
+    }
+    return std::nullopt;
   }
+  const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
+  if (!category) {
+    logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
+    _services.counters.count(wire::Reason::no_category);
+    return std::nullopt;
+  }
+  const auto type = message.uint32(wire::kVeltraMessageParametersType);
+  if (!type) {
+    logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
+    _services.counters.count(wire::Reason::no_type);
+    return std::nullopt;
+  }
+  const auto category16 = static_cast<std::uint16_t>(*category);
+  const auto type16 = static_cast<std::uint16_t>(*type);
+  const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
+  const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
+  const platform::TimeValue time = _services.clock.now();
+  _services.counters.count(wire::Reason::message_taken_in);
+  sayWithoutUserInfo();
+  const std::int32_t hierarchy = hierarchyOf(_backends.get());
+  if (hierarchy > 0 || _aggregation->active()) {
+    aggregateMessage(hierarchy, platform::timevalToSeconds(time), category16, type16, payload);
+  }
+  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog);
+}
+
+void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
+                                         std::uint16_t respCode) {
+  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), Origin::session);
+  logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
+}
+
+// Once, not for each message; a root says it too, though nobody looks for its ancestors.
+void VeltradSession::sayWithoutUserInfo() {
+  if (_saidWithoutUserInfo) return;
+  _saidWithoutUserInfo = true;
+  if (_userInfo) return;
+  logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", _sessionID);
+}
+
+void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category,
+                                      std::uint16_t type, const Dictionary* payload) {
+  const FamilyPlace place{*_aggregation, _userInfo, hierarchy};
+  // A root has no ancestors, so it needs no look at them and no lock of the families'.
+  const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
+  if (!toAncestor && !_aggregation->active()) return;
+  const std::string copy = aggregatedCopy(_sessionInfo, _userInfo, timestamp, category, type, payload);
+  CopySent sent;
+  if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
+  if (!sent.taken) sent = _aggregation->sendToAggregator(copy);
+  if (sent.line) logError("%s", sent.line->c_str());
+}
+
+void VeltradSession::flushMessagesWithCompletion(wire::FlushReply completion) {
+  logDebug("flushMessagesWithCompletion: Flushing messages for session %u", _sessionID);
+  flushBackends(_backends.get(), _services.flushes, _services.messageLog, std::move(completion));
+}
+
+void VeltradSession::uploadFileAtPath(std::string path, std::string extensionToken,
+                                      wire::BooleanReply completionHandler) {
+  logDebug("uploadFileAtPath: Uploading file for session %u", _sessionID);
+  const bool uploaded = uploadFile(_backends.get(), path, extensionToken, _services.messageLog);
+  if (completionHandler) completionHandler(uploaded);
+}
+
+void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
+  const bool uploaded = uploadLogDataArray(_backends.get(), logData);
+  if (completionHandler) completionHandler(uploaded, std::nullopt);
+}
+
+void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
+                                                wire::OptionalDictionary userInfo, std::uint16_t category,
+                                                std::uint16_t type, wire::OptionalDictionary payload,
+                                                wire::StringReply reply) {
+  if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
+      !info->uint32(wire::kVeltraSessionInfoSessionID)) {
+    logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
+    _services.counters.count(wire::Reason::no_identifiers);
+    return;  // the reply is never given, which ends the client's call
+  }
+  _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
+  backends::SharedDictionary kept;
+  backends::SharedDictionary identity;
+  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
+    _services.counters.count(wire::Reason::message_over_share);
+    return;
+  }
+  _sessionInfo = kept;
+  receivedUserInfo(identity);
+  logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
+  if (!storebag) {
+    _services.counters.count(wire::Reason::no_storebag);
+    if (reply) reply("storebag not available");
+    return;
+  }
+  _services.counters.count(wire::Reason::one_shot_taken_in);
+  veltrad::session::sendMessageWithSessionInfo(
+      {_services.factory, _services.device, _services.library, _services.clock, _account, true},
+      _services.messageLog,
+      {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
+  if (reply) reply("finished");
 }
 
 void VeltradSession::end() {
-  logDebug("dealloc: VeltradSession dealloc: %u", sessionID());
+  logDebug("dealloc: VeltradSession dealloc: %u", _sessionID);
   Dictionary payload;
-  payload.setIfPresent("StorebagVersion", storebagVersion());
+  payload.setIfPresent("StorebagVersion", _storebagVersion);
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
-  if (const auto line = shutdownSessionAggregation()) logError("%s", line->c_str());
+  if (const auto line = _aggregation->shutdownSessionAggregation(_sessionID)) logError("%s", line->c_str());
   // Nobody sends to this client any more: the invalidation has taken the session from its list.
-  if (const auto line = _dropLine.rest()) logError("%s", line->c_str());
-  std::shared_ptr<const BackendSet> released;
-  std::shared_ptr<ipc::Connection> connection;  // may be the last reference: goes after the lock
-  {
-    const Lock held(_mutex);
-    released.swap(_backends);
-    connection.swap(_connection);
-    _sessionInfo = nullptr;
-    _userInfo = nullptr;
-    _storebagVersion = std::nullopt;
-  }
+  if (const auto line = _aggregation->end()) logError("%s", line->c_str());
+  const auto released = std::exchange(_backends, nullptr);
+  _sessionInfo = nullptr;
+  _userInfo = nullptr;
+  _storebagVersion = std::nullopt;
   if (released) {
     for (const auto& [name, backend] : *released) backend->cleanup();
   }

@@ -32,22 +32,6 @@ TEST(LockOrderDeathTest, aLockOfNoHigherRankAborts) {
   EXPECT_DEATH(takeBoth(kAboveLeaves, LockRank::leaf), "a lock of rank 100 is wanted while one of rank 101");
 }
 
-void takeAgain(RecursiveMutex& mutex, Mutex& above) NO_THREAD_SAFETY_ANALYSIS {
-  mutex.lock();
-  above.lock();
-  mutex.lock();
-  mutex.unlock();
-  above.unlock();
-  mutex.unlock();
-}
-
-TEST(LockOrderDeathTest, aThreadMayTakeItsRecursiveLockAgainUnderAnother) {
-  RecursiveMutex mutex{LockRank{10}};
-  Mutex above{LockRank{20}};
-  takeAgain(mutex, above);
-  takeBoth(LockRank{5}, LockRank{10});  // all of them were let go
-}
-
 #endif
 
 }  // namespace

@@ -5,7 +5,10 @@
 
 #include <condition_variable>
 #include <mutex>
+#include <new>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "config/storebag_content.h"
 #include "config/storebag_source.h"
@@ -26,6 +29,7 @@ struct Source final : config::StorebagSource {
     ++fetches;
     changed.notify_all();
     changed.wait(held, [this] { return !hold; });
+    if (std::exchange(lacksMemory, false)) throw std::bad_alloc();
     conditional = *lastModified;
     maxAge = age;
     notModified = answersNotModified;
@@ -52,17 +56,16 @@ struct Source final : config::StorebagSource {
   bool answersNotModified = false;
   bool attempts = true;
   bool hold = false;
+  bool lacksMemory = false;
   int fetches = 0;
 };
 
 class Cache : public ::testing::Test {
  protected:
   std::shared_ptr<const config::StorebagSection> ask(std::int32_t clientType) {
-    const Lock held(_lock);
-    return cache.storebagForClientType(clientType, _lock);
+    return cache.storebagForClientType(clientType);
   }
   std::optional<std::string> version(std::int32_t clientType) {
-    const Lock held(_lock);
     return cache.versionForClientType(clientType);
   }
 
@@ -70,9 +73,6 @@ class Cache : public ::testing::Test {
   FakeClock clock;
   Source source;
   daemon::StorebagCache cache{source, clock};
-
- private:
-  RecursiveMutex _lock STOREBAG_CACHE_LOCK;
 };
 
 // Nothing is recorded, so the next session asks again at once.
@@ -152,6 +152,47 @@ TEST_F(Cache, ATypeWithoutAStorebagLeavesNoRecord) {
   EXPECT_EQ(ask(2), nullptr);
   EXPECT_EQ(source.fetches, 2);
   EXPECT_EQ(version(2), std::nullopt);
+}
+
+TEST_F(Cache, AFetchThatLackedMemoryIsOverForThoseWhoWait) {
+  source.hold = source.lacksMemory = true;
+  std::shared_ptr<const config::StorebagSection> second;
+  std::thread fetching([&] { EXPECT_THROW(ask(7), std::bad_alloc); });
+  source.waitForFetches(1);
+  std::thread waiting([&] { second = ask(11); });
+  source.letGo();
+  fetching.join();
+  waiting.join();
+  EXPECT_NE(second, nullptr);
+}
+
+// What a record says a moment after it was fetched, or failed.
+TEST(StorebagRecord, AgeAndOutcomeDecide) {
+  using enum daemon::CacheVerdict;
+  struct Case {
+    bool attempted, successful;
+    double age;
+    daemon::CacheVerdict verdict;
+  };
+  for (const Case& c : std::vector<Case>{{false, false, 0, fetch},
+                                         {false, true, 0, fetch},
+                                         {true, true, 0, serve},
+                                         {true, true, 99.9, serve},
+                                         {true, true, 100, fetch},
+                                         {true, true, -99, serve},
+                                         {true, true, -100, fetch},
+                                         {true, false, 0, wait},
+                                         {true, false, 899.9, wait},
+                                         {true, false, 900, fetch},
+                                         {true, false, -899, wait},
+                                         {true, false, -901, fetch}}) {
+    daemon::StorebagRecord record;
+    record.attempted = c.attempted;
+    record.fetchSuccessful = c.successful;
+    record.fetchTime = 5'000;
+    record.maxAge = 100;
+    EXPECT_EQ(daemon::verdictOfRecord(record, 5'000 + c.age), c.verdict) << c.age;
+  }
 }
 
 TEST_F(Cache, OthersGoOnDuringADownloadAndTheSameNameWaits) {

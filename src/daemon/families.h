@@ -1,0 +1,62 @@
+// Families: sessions that share an identity, and what that makes of each: its parent, its combined ID, its
+// back ends' states, the one client that gets copies.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <memory_resource>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+#include <vector>
+
+#include "daemon/correlated_list.h"
+#include "daemon/lock_ranks.h"
+
+namespace veltrad::daemon {
+
+// Any thread; one lock. Knows of a session what it was told, and calls none: under the lock it reads and sets
+// states and IDs of back ends and queues copies and end marks, which wait for nobody. What a refresh has
+// computed is set before the lock is let go, or an older one could follow a newer one.
+class Families {
+ public:
+  // Of a member; nothing for others.
+  void sessionInfoUpdated(session::FamilyFacts facts);
+  void userInfoUpdatedForSession(session::FamilyFacts facts);
+  void updateDownstreamSessions(session::FamilyFacts facts);
+  void leave(const session::Aggregation& session);
+
+  bool ancestorAggregates(const session::FamilyPlace& place);
+  session::CopySent sendToAncestor(const session::FamilyPlace& place, std::string_view copy);
+
+  // Without a lock.
+  std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
+
+ private:
+  using Members = std::unordered_map<const session::Aggregation*, FamilyMember>;
+
+  // What they give back or swap away goes after the lock.
+  void tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
+  Members::node_type takeOut(const session::Aggregation& session) REQUIRES(_lock);
+  const CorrelatedList* list(std::string_view key) const REQUIRES(_lock);
+  const CorrelatedList* listHolding(const FamilyMember& member, const char* operation) const REQUIRES(_lock);
+  std::optional<std::string> parentSessionIDString(const FamilyMember& member) const REQUIRES(_lock);
+  const FamilyMember* parentSession(const FamilyMember& member) const REQUIRES(_lock);
+  const FamilyMember* ancestorWithAggregator(const session::FamilyPlace& place) const REQUIRES(_lock);
+  void updateCombinedSessionID(const FamilyMember& member) const REQUIRES(_lock);
+  void syncReportingStates(const FamilyMember& member) const REQUIRES(_lock);
+  // The lines that are to be logged once the lock is released.
+  std::vector<std::string> refresh(FamilyMember& member) REQUIRES(_lock);
+
+  Mutex _lock FAMILIES_LOCK;
+  // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
+  // the sessions beside it have freed.
+  std::pmr::unsynchronized_pool_resource _listMemory GUARDED_BY(_lock);
+  CorrelatedLists _correlatedSessions GUARDED_BY(_lock){&_listMemory};
+  Members _members GUARDED_BY(_lock);
+
+  std::atomic<std::size_t> _userInfoKeyCount{0};
+};
+
+}  // namespace veltrad::daemon

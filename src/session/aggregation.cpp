@@ -1,0 +1,58 @@
+// Copies on their way to one client.
+#include "session/aggregation.h"
+
+#include "ipc/client_events.h"
+#include "ipc/connection.h"
+#include "platform/log.h"
+
+namespace veltrad::session {
+
+Aggregation::Aggregation(std::shared_ptr<ipc::Connection> connection) : _connection(std::move(connection)) {}
+
+Aggregation::~Aggregation() = default;
+
+void Aggregation::setActive(bool active) {
+  const Lock held(_mutex);
+  _active.store(active, std::memory_order_relaxed);
+}
+
+CopySent Aggregation::sendToAggregator(std::string_view copy) {
+  const Lock held(_mutex);
+  if (!active()) return {};
+  return {true, queue(copy)};
+}
+
+std::optional<std::string> Aggregation::shutdownSessionAggregation(std::uint32_t sessionID) {
+  logDebug("shutdownSessionAggregation: Disable aggregation module for session %u", sessionID);
+  const Lock held(_mutex);
+  if (!_active.exchange(false, std::memory_order_relaxed)) return std::nullopt;
+  return queue(ipc::messageToClient(std::nullopt, 0, 0, 0, std::nullopt));
+}
+
+std::optional<std::string> Aggregation::queue(std::string_view frame) {
+  const auto failure = _connection->sendEvent(frame);
+  if (!failure) return std::nullopt;
+  return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + *failure);
+}
+
+std::optional<std::string> Aggregation::end() {
+  std::shared_ptr<ipc::Connection> connection;  // may be the last reference: goes after the lock
+  const Lock held(_mutex);
+  _active.store(false, std::memory_order_relaxed);
+  connection.swap(_connection);
+  return _dropLine.rest();
+}
+
+std::string aggregatedCopy(const backends::SharedDictionary& sessionInfo,
+                           const backends::SharedDictionary& userInfo, double timestamp,
+                           std::uint16_t category, std::uint16_t type, const Dictionary* payload) {
+  std::optional<Dictionary> merged;
+  if (payload) {
+    merged = *payload;
+    if (userInfo) merged->merge(*userInfo);
+  }
+  return ipc::messageToClient(sessionInfo ? std::optional(*sessionInfo) : std::nullopt, timestamp, category,
+                              type, std::move(merged));
+}
+
+}  // namespace veltrad::session

@@ -1,0 +1,83 @@
+// Every back end of a session, one after the other.
+#include "session/routing.h"
+
+#include "base/text.h"
+#include "platform/log.h"
+#include "session/flush_counters.h"
+#include "support/message_log.h"
+#include "wire/constants.h"
+
+namespace veltrad::session {
+
+std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
+                                           support::MessageLog& messageLog) {
+  std::optional<std::string> result;
+  for (const auto& [name, backend] : backends) {
+    auto answer =
+        backend->sendMessage(message.payload, message.time, message.category, message.type, message.flag);
+    if (!answer) continue;
+    messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", {name, *answer});
+    const bool replaces = backend->name() == wire::kVeltraBackendHTTPPost;
+    const bool standsIn = backend->name() == wire::kVeltraBackendDashboard && !result;
+    if (replaces || standsIn) result = std::move(answer);
+  }
+  return result;
+}
+
+void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::MessageLog& messageLog,
+                   wire::FlushReply completion) {
+  if (!backends) {
+    const char* text = "No backends available to send message";
+    logDebug("internalFlushMessagesWithCompletion: %s", text);
+    if (completion) completion(std::nullopt, wire::makeReportingError(text, -1));
+    return;
+  }
+  if (backends->empty()) {
+    if (completion) completion(std::nullopt, std::nullopt);
+    return;
+  }
+  const auto flush = flushes.begin(backends->size(), std::move(completion));
+  for (const auto& [name, backend] : *backends) {
+    // Holds neither the session nor the backend: it may run on the HTTP thread, long after both have gone.
+    backend->flushMessagesWithCompletion(
+        [&flushes, &messageLog, flush, key = name, own = backend->name()](
+            const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
+          logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
+          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", {key, *answer});
+          flushes.finished(*flush, answer, error);
+        });
+  }
+}
+
+bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
+                support::MessageLog& messageLog) {
+  bool uploaded = false;
+  if (backends) {
+    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadFileAtPath(path, extensionToken);
+  }
+  if (uploaded) {
+    logDebug("uploadFileWithURL: File upload successful for %s", path.c_str());
+  } else {
+    logError("uploadFileWithURL: File upload failed for %s", path.c_str());
+  }
+  // The full text of the file's address.
+  messageLog.writeToLogFile(
+      "[uploadFileWithURL] Upload %@ for file %@",
+      {uploaded ? "succeeded" : "failed", "file://" + percentEncoded(path, "/!$&'()*+,;=:@")});
+  return uploaded;
+}
+
+bool uploadLogDataArray(const BackendSet* backends, const Array& logData) {
+  bool uploaded = false;
+  if (backends) {
+    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadLogData(logData);
+  }
+  if (uploaded) {
+    logDebug("uploadLogData: Log data array upload successful");
+  } else {
+    logError("uploadLogData: Log data array upload failed");
+  }
+  return uploaded;
+}
+
+}  // namespace veltrad::session
