@@ -20,24 +20,33 @@ constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
+  const Dictionary* section = profile.asDictionary();
+  const std::string family = productFamily.value_or("");
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName({_services, _logData, _dashboards, owner}, name,
-                                          profile.asDictionary(), productFamily.value_or(""));
+    return DashboardBackend::initWithName(
+        {_services.random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner},
+        name, section, family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
-    return UploadBackend::initWithName(_services, _files, name, profile.asDictionary(),
-                                       productFamily.value_or(""));
+    return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
+                                        _services.counters, _services.scratchDirectory},
+                                       name, section, family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
-    return HTTPSPostBackend::initWithName(_services, _postErrors, name, profile.asDictionary(),
-                                          productFamily);
+    return HTTPSPostBackend::initWithName({_services.random,
+                                           _services.locale,
+                                           _services.counters,
+                                           _posts,
+                                           {_services.preferences, _services.library, _services.settings}},
+                                          name, section, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""));
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
+                                       section, family);
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services, name, profile.asDictionary(), productFamily.value_or(""),
-                                     clientType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
+                                     section, family, clientType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -77,10 +77,6 @@ std::shared_ptr<const BackendSet> VeltradSession::backends() const {
   return _backends;
 }
 
-std::string VeltradSession::deviceID() const {
-  return _deviceid;
-}
-
 std::optional<std::int32_t> VeltradSession::clientType() const {
   const backends::SharedDictionary info = sessionInfo();
   return info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
@@ -146,12 +142,13 @@ void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
   const backends::SharedDictionary info = sessionInfo();
   // It may have been out of reach when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
+  backends::SessionFacts facts;
+  facts.device.udid = _deviceid;
+  facts.userInfo = userInfo();
+  facts.combinedSessionIDString = _sessionIDString;
   auto made =
       createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
-                     &storebag, info.get(), userInfo(), deviceID());
-  if (made) {
-    for (const auto& [name, backend] : *made) backend->setCombinedSessionIDString(_sessionIDString);
-  }
+                     &storebag, info.get(), std::move(facts));
   {
     const Lock held(_mutex);
     _backends.swap(made);

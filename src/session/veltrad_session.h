@@ -138,7 +138,6 @@ class VeltradSession final : public wire::ClientSessionInterface,
   void internalFlushMessagesWithCompletion(wire::FlushReply completion);
 
   std::shared_ptr<const BackendSet> backends() const;
-  std::string deviceID() const;
 
   // Constant after construction.
   const SessionServices _services;

@@ -11,10 +11,8 @@ namespace {
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   struct Counting final : backends::VeltraBackend {
     explicit Counting(platform::Random& random) : backends::VeltraBackend("x", {}, "", random) {}
-    using backends::VeltraBackend::sendMessage;
-    std::optional<std::string> sendMessage(const Dictionary*, platform::TimeValue, std::uint16_t,
-                                           std::uint16_t, std::uint16_t eventID, std::int32_t) override {
-      return std::to_string(eventID);
+    std::optional<std::string> sendNumberedMessage(const backends::NumberedMessage& message) override {
+      return std::to_string(message.eventID);
     }
   };
   FakeRandom random;
@@ -25,9 +23,9 @@ TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "1");
   for (const auto& [text, major, minor] :
        {std::tuple{"9.3", 9, 3}, {"10", 10, 0}, {"300.1", 44, 1}, {"x.y", 0, 0}, {"8.0.7", 8, 0}}) {
-    backend->setSelfVersion(text);
-    EXPECT_EQ(backend->selfVersionMajor(), major) << text;
-    EXPECT_EQ(backend->selfVersionMinor(), minor) << text;
+    const auto version = backends::SelfVersion::of(text);
+    EXPECT_EQ(version.major, major) << text;
+    EXPECT_EQ(version.minor, minor) << text;
   }
   EXPECT_EQ(backends::VeltraBackend::convertIntoSHA256("").substr(0, 8), "e3b0c442");
 }

@@ -1,88 +1,26 @@
-// The HTTPS post backend: construction, and whether and how it reports for the current client.
-#include "backends/https/https_post_backend.h"
+// Whether and how the back end reports for the current client.
+#include "backends/https/https_post_state.h"
+
 #include "backends/https/text_lists.h"
 #include "formats/json.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
-#include "platform/preferences.h"
-#include "platform/uuid.h"
-#include "support/veltra.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
 
 namespace {
-bool diagnosticLogSubmissionEnabled(platform::Preferences& preferences) {
-  const auto consent = preferences.value(platform::kVeltraPreferenceDomain, "DiagnosticLogSubmissionEnabled");
-  return consent && consent->toBoolean().value_or(false);
-}
-
 std::optional<std::string> optionalText(const std::string* text) {
   return text ? std::optional<std::string>(*text) : std::nullopt;
 }
 }  // namespace
 
-bool textMeansYes(const std::optional<std::string>& text) {
-  if (!text) return false;
-  std::size_t at = text->find_first_not_of(" \t\n\v\f\r");
-  if (at == std::string::npos) return false;
-  if ((*text)[at] == '+' || (*text)[at] == '-') ++at;
-  at = text->find_first_not_of('0', at);
-  if (at == std::string::npos) return false;
-  return std::string_view("YyTt123456789").find((*text)[at]) != std::string_view::npos;
-}
-
-std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
-    const BackendServices& services, PostErrors& errors, const std::string& name, const Dictionary* profile,
-    const std::optional<std::string>& productFamily) {
-  if (!profile || !productFamily) return nullptr;
-  if (!profile->array("clients")) {
-    logError("HTTPSPostBackend(initWithName): can't find the client list.");
-    return nullptr;
-  }
-  std::shared_ptr<HTTPSPostBackend> made(
-      new HTTPSPostBackend(services, errors, name, *profile, *productFamily));
-  if (made->_uuidRespectDnu.empty() || made->_uuidOverrideDnu.empty()) {
-    logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
-    return nullptr;
-  }
-  return made;
-}
-
-HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, PostErrors& errors,
-                                   const std::string& name, const Dictionary& profile,
-                                   const std::string& productFamily)
-    : VeltraBackend(name, profile, productFamily, services.random),
-      _services(services),
-      _errors(errors),
-      _dnuEnabled(diagnosticLogSubmissionEnabled(services.preferences)),
-      _forceEventLogging(
-          textMeansYes(services.preferences.text(platform::kVeltraPreferenceDomain, "forceEventLogging"))),
-      _uuidRespectDnu(services.library.getPersistentIdentifierForDNU(true).value_or("")),
-      _uuidOverrideDnu(services.library.getPersistentIdentifierForDNU(false).value_or("")),
-      _held(std::make_shared<HeldEvents>(services.counters)) {
-  _postURL = services.preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL");
-  if (_postURL)
-    logDebug("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());
-  _useDefaultPostURL = _postURL.has_value();
-  _realtimePostURL = services.preferences.text(platform::kVeltraPreferenceDomain, "httpsRealtimePostURL");
-  if (_realtimePostURL) {
-    logDebug("HTTPSPostBackend(initWithName): Using user default '%s' for realtimePostURL",
-             _realtimePostURL->c_str());
-  }
-  _useDefaultRealtimePostURL = _realtimePostURL.has_value();
-  setDisplayURL(optionalText(profile.string("display_url")));
-}
-
-void HTTPSPostBackend::updateState() {
-  setState(updateBackendState());
-}
-
-std::int32_t HTTPSPostBackend::updateBackendState() {
-  const Array* clients = profile().array("clients");
+std::int32_t HTTPSPostState::updateBackendState() {
+  const Array* clients = _backEnd.profile().array("clients");
   if (!clients) return kBackendDisabled;
-  const SharedDictionary userInfo = userInfoDict();
+  const auto facts = _backEnd.facts();
+  const SharedDictionary& userInfo = facts->userInfo;
   const auto clientName =
       optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoClientName) : nullptr);
   const auto serviceName =
@@ -95,23 +33,23 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
     break;
   }
   if (entry) applyExpedite(*entry);
-  if (!requireUserInfo()) return reportForEveryone(*clients);
+  if (!facts->requireUserInfo) return reportForEveryone(*clients);
   if (!userInfo) {
-    _services.counters.count("back end waiting: user info is required, and there is none");
+    _counters.count("back end waiting: user info is required, and there is none");
     return kBackendWaiting;
   }
   if (!entry) {
-    _services.counters.count("back end disabled: no client entry fits");
+    _counters.count("back end disabled: no client entry fits");
     return kBackendDisabled;
   }
   return reportForClient(*entry, clientName, serviceName);
 }
 
-std::int32_t HTTPSPostBackend::reportForEveryone(const Array& clients) {
+std::int32_t HTTPSPostState::reportForEveryone(const Array& clients) {
   const Dictionary* taken = nullptr;
   for (const Value& client : clients) {
     const Dictionary* entry = client.asDictionary();
-    if (!entry || !updatePostLink(*entry)) continue;
+    if (!entry || !_links.updatePostLink(*entry)) continue;
     taken = entry;
     break;
   }
@@ -119,44 +57,41 @@ std::int32_t HTTPSPostBackend::reportForEveryone(const Array& clients) {
   return kBackendReporting;
 }
 
-std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
-                                               const std::optional<std::string>& clientName,
-                                               const std::optional<std::string>& serviceName) {
-  const auto country = _services.locale.countryCode();
+std::int32_t HTTPSPostState::reportForClient(const Dictionary& entry,
+                                             const std::optional<std::string>& clientName,
+                                             const std::optional<std::string>& serviceName) {
+  const auto country = _locale.countryCode();
   const ClientVerdict verdict =
-      decideOnClient(entry, {_dnuEnabled, country, productFamily(), hardwareType(), samplingFactor()});
-  setHierarchy(verdict.hierarchy);
-  _dnuType = verdict.dnuType;
+      decideOnClient(entry, {_identity.consent(), country, _backEnd.productFamily(),
+                             _backEnd.facts()->device.hardwareType, _backEnd.samplingFactor()});
+  _backEnd.setHierarchy(verdict.hierarchy);
+  _identity.setDNUType(verdict.dnuType);
   if (verdict.filters) _filters.createFiltersFromArray(*verdict.filters);
   if (verdict.samplingReached) takeSampling(verdict, country);
   if (verdict.refusal != ClientRefusal::none) {
     logRefusal(entry, verdict, country);
-    _services.counters.count(reasonOf(verdict.refusal));
+    _counters.count(reasonOf(verdict.refusal));
   }
-  if (verdict.state == kBackendHeld)
-    _services.counters.count("back end held: sampled out, may be overridden");
+  if (verdict.state == kBackendHeld) _counters.count("back end held: sampled out, may be overridden");
   if (!verdict.samplingReached) return kBackendDisabled;
 
   resetBackendStateWithClient(&entry);
-  if (entry.contains("custom_clientId")) {
-    auto identifier = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
-    if (!identifier) {  // another would be no better than a wrong one
-      _services.counters.count("back end disabled: its client's identifier cannot be read");
-      return kBackendDisabled;
-    }
-    _uuidCustom = std::move(identifier);
+  if (entry.contains("custom_clientId") && !_identity.takeCustomClientID(clientName, serviceName)) {
+    _counters.count("back end disabled: its client's identifier cannot be read");
+    return kBackendDisabled;
   }
   logDebug(
       "HTTPSPostBackend(updateBackendState): %s: client found %s:%s, state=%d, samplingFactor=%f, "
       "hierarchy=%d",
-      name().c_str(), clientName ? clientName->c_str() : "(null)",
-      serviceName ? serviceName->c_str() : "(null)", verdict.state, samplingFactor(), verdict.hierarchy);
-  updatePostLink(entry);
+      _backEnd.name().c_str(), clientName ? clientName->c_str() : "(null)",
+      serviceName ? serviceName->c_str() : "(null)", verdict.state, _backEnd.samplingFactor(),
+      verdict.hierarchy);
+  _links.updatePostLink(entry);
   return verdict.state;
 }
 
-void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
-                                  const std::optional<std::string>& country) const {
+void HTTPSPostState::logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+                                const std::optional<std::string>& country) const {
   const auto printed = [&entry](const char* key) {
     const Value* list = entry.find(key);
     return list ? formats::writeJSON(*list) : std::string("(null)");
@@ -171,12 +106,14 @@ void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& 
       break;
     case ClientRefusal::deviceNotListed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
-               productFamily().c_str(), printed("device_whitelist").c_str());
+               _backEnd.productFamily().c_str(), printed("device_whitelist").c_str());
       break;
-    case ClientRefusal::deviceListed:
+    case ClientRefusal::deviceListed: {
+      const auto hardwareType = _backEnd.facts()->device.hardwareType;
       logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
-               hardwareType() ? hardwareType()->c_str() : "(null)", printed("device_blacklist").c_str());
+               hardwareType ? hardwareType->c_str() : "(null)", printed("device_blacklist").c_str());
       break;
+    }
     case ClientRefusal::filtersMissing:
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;
@@ -187,62 +124,29 @@ void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& 
   }
 }
 
-void HTTPSPostBackend::takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country) {
+void HTTPSPostState::takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country) {
   if (verdict.countryThreshold) {
     logDebug("HTTPSPostBackend(updateBackendState): sampling threshold for %s changed from %.02f to %.02f",
              country ? country->c_str() : "(null)", verdict.thresholdBefore.value_or(0),
              verdict.threshold.value_or(0));
   }
-  setSamplingThreshold(verdict.threshold);
+  _backEnd.setSamplingThreshold(verdict.threshold);
   if (verdict.overrideReached) _overrideSampling = verdict.overrideSampling;
 }
 
-std::optional<std::string> HTTPSPostBackend::getPersistentIdentifierForCustomClientIDSuffix(
-    const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const {
-  const std::string key = "uuid:" + clientName.value_or("") + ":" + serviceName.value_or("");
-  auto value =
-      _services.preferences.textOrStore(platform::kVeltraPreferenceDomain, key, platform::randomUUIDText);
-  if (!value) return std::nullopt;
-  logInfo("getPersistentIdentifierForCustomClientIDSuffix: The value for %s: %s", key.c_str(),
-          value->c_str());
-  return value;
-}
-
-void HTTPSPostBackend::applyExpedite(const Dictionary& entry) {
+void HTTPSPostState::applyExpedite(const Dictionary& entry) {
   const auto expedite = entry.real("expedite");
   if (!expedite) return;
-  setBatchEvents(*expedite == 0);
-  logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", batchEvents());
+  _batchEvents = *expedite == 0;
+  logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", *_batchEvents);
 }
 
-bool HTTPSPostBackend::updatePostLink(const Dictionary& entry) {
-  bool changed = false;
-  if (!(_useDefaultPostURL && _postURL)) {
-    _useDefaultPostURL = false;
-    if (const std::string* url = entry.string("post_url")) {
-      _postURL = *url;
-      logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", url->c_str());
-      changed = true;
-    }
-  }
-  if (_useDefaultRealtimePostURL && _realtimePostURL) return changed;
-  _useDefaultRealtimePostURL = false;
-  if (const std::string* url = entry.string("realtime_post_url")) {
-    _realtimePostURL = *url;
-    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL", url->c_str());
-  } else {
-    _realtimePostURL = _postURL;
-    logDebug("HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '%s'",
-             _postURL ? _postURL->c_str() : "(null)");
-  }
-  return changed;
-}
-
-void HTTPSPostBackend::resetBackendStateWithClient(const Dictionary* entry) {
+void HTTPSPostState::resetBackendStateWithClient(const Dictionary* entry) {
   _eventThreshold = entry ? entry->int32("event_threshold").value_or(0) : 0;
   logDebug("resetBackendStateWithClient: event_threshold set to %d", _eventThreshold);
-  _extrasOnInternal = entry ? entry->int32("extras_on_internal").value_or(0) : 0;
-  logDebug("setBackendStateWithClient: extras on internal is set to %d", _extrasOnInternal);
+  const std::int32_t extras = entry ? entry->int32("extras_on_internal").value_or(0) : 0;
+  _identity.setExtrasOnInternal(extras);
+  logDebug("setBackendStateWithClient: extras on internal is set to %d", extras);
 }
 
 }  // namespace veltrad::backends

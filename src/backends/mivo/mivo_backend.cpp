@@ -15,11 +15,13 @@ bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
   return clientType >= 0 && clientType <= kHighestClientType && (kAllowedClientTypes >> clientType & 1) != 0;
 }
 
-std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& services,
-                                                       const std::string& name, const Dictionary* profile,
+std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platform::Counters& counters,
+                                                       platform::Random& random, const std::string& name,
+                                                       const Dictionary* profile,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, profile, productFamily));
+  std::shared_ptr<MivoBackend> backend(
+      new MivoBackend(bundle, counters, random, name, profile, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -29,11 +31,11 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& se
   return backend;
 }
 
-MivoBackend::MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
-                         const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
-      _counters(services.counters),
-      _clientBundle(services.adaptorBundle) {}
+MivoBackend::MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
+                         const std::string& name, const Dictionary* profile, const std::string& productFamily)
+    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, random),
+      _counters(counters),
+      _clientBundle(bundle) {}
 
 void MivoBackend::loadAdaptor() {
   std::string failure;
@@ -47,9 +49,7 @@ void MivoBackend::loadAdaptor() {
   if (!_mivoAdaptor) logWarning("MivoBackend(initWithName): no Mivo adaptor: %s", failure.c_str());
 }
 
-std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, platform::TimeValue,
-                                                    std::uint16_t method, std::uint16_t respCode,
-                                                    std::uint16_t, std::int32_t) {
+std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
@@ -57,7 +57,8 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
                                  : "message dropped: there is no adaptor");
     return std::nullopt;
   }
-  const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, method, respCode, payload);
+  const auto thrown =
+      _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode, message.payload);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());

@@ -13,6 +13,7 @@
 #include "platform/counters.h"
 #include "platform/lent_files.h"
 #include "platform/log.h"
+#include "platform/memory_budget.h"
 #include "support/gzip.h"
 
 namespace veltrad::backends {
@@ -48,29 +49,28 @@ void sayUnreadable(const std::string& path, int error) {
 
 }  // namespace
 
-std::shared_ptr<UploadBackend> UploadBackend::initWithName(const BackendServices& services,
-                                                           FileUploads& uploads, const std::string& name,
-                                                           const Dictionary* profile,
+std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& making,
+                                                           const std::string& name, const Dictionary* profile,
                                                            const std::string& productFamily) {
   const std::string* url = profile ? profile->string("post_url") : nullptr;
   if (!url) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  std::shared_ptr<UploadBackend> backend(new UploadBackend(services, uploads, name, *profile, productFamily));
+  std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile, productFamily));
   backend->setUploadURL(*url);
   if (const std::string* display = profile->string("display_url")) backend->setDisplayURL(*display);
   return backend;
 }
 
-UploadBackend::UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
-                             const Dictionary& profile, const std::string& productFamily)
-    : VeltraBackend(name, profile, productFamily, services.random),
-      _uploads(uploads),
-      _http(services.http),
-      _counters(services.counters),
-      _lentFiles(services.lentFiles),
-      _scratchDirectory(services.scratchDirectory) {}
+UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name, const Dictionary& profile,
+                             const std::string& productFamily)
+    : VeltraBackend(name, profile, productFamily, making.random),
+      _uploads(making.uploads),
+      _http(making.http),
+      _lentFiles(making.lentFiles),
+      _counters(making.counters),
+      _scratchDirectory(making.scratchDirectory) {}
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
@@ -79,14 +79,15 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   const auto lent = _lentFiles.consume(extensionToken);
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
-  const auto place = _uploads.enter(userOf(memoryAccount()), _http);
+  const auto facts = this->facts();
+  const auto place = _uploads.enter(userOf(facts->account), _http);
   if (!place) {
     sayStopping();
     return false;
   }
   CompressedFile gzipped(_scratchDirectory);
   if (!compress(*file, path, gzipped)) return false;
-  auto request = uploadRequest(*url, {udid(), sessionID()}, path);
+  auto request = uploadRequest(*url, {facts->device.udid, facts->sessionID}, path);
   if (!request) {
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
     _counters.count("file lost: its upload address makes no request");

@@ -7,11 +7,11 @@
 #include <string>
 
 #include "backends/backend.h"
-#include "backends/backend_factory.h"
 #include "backends/upload/file_snapshot.h"
 #include "http/http_client.h"
 
 namespace veltrad::platform {
+class Counters;
 class LentFile;
 class LentFiles;
 }  // namespace veltrad::platform
@@ -21,14 +21,24 @@ namespace veltrad::backends {
 class CompressedFile;
 class FileUploads;
 
+// What an upload back end is made from. Everything outlives it.
+struct UploadMaking {
+  platform::Random& random;
+  FileUploads& uploads;
+  http::HTTPClient& http;
+  platform::LentFiles& lentFiles;
+  platform::Counters& counters;
+  std::string scratchDirectory;  // for files without a name
+};
+
 // Keeps nothing between uploads but its address. Sees a file through the descriptor that its client lent,
 // never by a path. Takes no part in message reporting.
 class UploadBackend final : public VeltraBackend {
  public:
   // From a storebag's section: "post_url" (without a query), and where given "display_url". Null, after one
   // error line, without the first.
-  static std::shared_ptr<UploadBackend> initWithName(const BackendServices& services, FileUploads& uploads,
-                                                     const std::string& name, const Dictionary* profile,
+  static std::shared_ptr<UploadBackend> initWithName(const UploadMaking& making, const std::string& name,
+                                                     const Dictionary* profile,
                                                      const std::string& productFamily);
 
   // True when the request was carried out, whatever became of it: the answer alone decides whether the client
@@ -40,8 +50,8 @@ class UploadBackend final : public VeltraBackend {
   void setUploadURL(std::optional<std::string> value);
 
  private:
-  UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
-                const Dictionary& profile, const std::string& productFamily);
+  UploadBackend(const UploadMaking& making, const std::string& name, const Dictionary& profile,
+                const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
@@ -53,8 +63,8 @@ class UploadBackend final : public VeltraBackend {
   // Constant after construction.
   FileUploads& _uploads;
   http::HTTPClient& _http;
-  platform::Counters& _counters;
   platform::LentFiles& _lentFiles;
+  platform::Counters& _counters;
   const std::string _scratchDirectory;
 
   mutable Mutex _urlMutex BACKEND_LOCK{LockRank::backend};
