@@ -17,6 +17,7 @@
 #include "wire/error.h"
 
 namespace veltrad::platform {
+class Counters;
 class Random;
 }  // namespace veltrad::platform
 

@@ -17,7 +17,7 @@ namespace {
 constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 }  // namespace
 
-std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
+std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
   const Dictionary* section = profile.asDictionary();

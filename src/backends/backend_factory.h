@@ -60,24 +60,14 @@ struct BackendServices {
 
 class BackendFactory {
  public:
-  virtual ~BackendFactory() = default;
-  // Null: no such backend here, or it cannot work with this profile; one line has said so.
-  virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
-                                                            const std::optional<std::string>& productFamily,
-                                                            std::int32_t clientType,
-                                                            const BackendOwner& owner = {}) = 0;
-};
-
-class StandardBackendFactory final : public BackendFactory {
- public:
-  explicit StandardBackendFactory(BackendServices services)
+  explicit BackendFactory(BackendServices services)
       : _services(services),
         _posts(services.http, services.clock, services.counters),
         _logData(services.http, services.counters) {}
+  // Null: no such backend here, or it cannot work with this profile; one line has said so.
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    std::int32_t clientType,
-                                                    const BackendOwner& owner = {}) override;
+                                                    std::int32_t clientType, const BackendOwner& owner = {});
   // The lines that were held back: before the daemon ends.
   void sayRest() { _posts.sayRest(); }
 

@@ -2,6 +2,7 @@
 #pragma once
 
 #include <cstdint>
+#include <cstdlib>
 #include <memory>
 #include <optional>
 #include <string>
@@ -27,7 +28,13 @@ struct DeviceFacts {
 // Of the client library.
 struct SelfVersion {
   // "9.3" gives 9 and 3, "10" gives 10 and 0; each modulo 256.
-  static SelfVersion of(const std::string& version);
+  static SelfVersion of(const std::string& version) {
+    const auto number = [](const char* text) {
+      return static_cast<std::uint8_t>(std::strtoll(text, nullptr, 10));
+    };
+    const std::size_t dot = version.find('.');
+    return {number(version.c_str()), number(dot == std::string::npos ? "" : version.c_str() + dot + 1)};
+  }
 
   std::uint8_t major = 0;
   std::uint8_t minor = 0;

@@ -7,10 +7,6 @@
 
 #include "backends/backend.h"
 
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
-
 namespace veltrad::backends {
 
 class EnergyLog;

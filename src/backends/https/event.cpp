@@ -13,6 +13,11 @@ namespace {
 // Bit n stands for client type n: 7, 11 and 13.
 constexpr std::uint32_t kNumericSessionIDTypes = 0x2880;
 
+// On internal builds only.
+bool reportsNumericSessionID(bool isInternal, std::int32_t compType) {
+  return isInternal && compType >= 0 && compType <= 13 && (kNumericSessionIDTypes >> compType & 1u) != 0;
+}
+
 std::int32_t coarsenedStart(double startTimeStamp) {
   const auto start = static_cast<std::int32_t>(static_cast<std::int64_t>(startTimeStamp));
   return start / 60 * 60;
@@ -26,10 +31,6 @@ double finiteOrMinusOne(double seconds) {
 std::string senderCode(std::int32_t compType) {
   const char* code = config::senderCodeForComponentType(compType);
   return code ? code : "";
-}
-
-bool reportsNumericSessionID(bool isInternal, std::int32_t compType) {
-  return isInternal && compType >= 0 && compType <= 13 && (kNumericSessionIDTypes >> compType & 1u) != 0;
 }
 
 Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::string& productFamily,

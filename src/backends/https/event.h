@@ -19,7 +19,4 @@ std::string senderCode(std::int32_t compType);
 Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::string& productFamily,
                                       const NumberedMessage& message, int timeZoneOffset);
 
-// On internal builds the client types 7, 11 and 13 report their numeric session ID.
-bool reportsNumericSessionID(bool isInternal, std::int32_t compType);
-
 }  // namespace veltrad::backends

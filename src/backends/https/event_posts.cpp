@@ -27,7 +27,14 @@ const char* reasonOf(http::HTTPError::Kind kind) {
   return "event lost: the post failed";
 }
 
+void logPostError(const std::optional<std::string>& text) {
+  if (text) logError("HTTPSPostBackend(postJsonMessage): post error: %s", text->c_str());
+}
 }  // namespace
+
+void EventPosts::sayRest() {
+  logPostError(_errorLine.rest());
+}
 
 void EventPosts::restrict(Dictionary& event) const {
   _counters.count("event field removed: JSON cannot carry it", restrictEventForJSON(event));
@@ -74,7 +81,7 @@ std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& back
   std::optional<wire::ReportingError> error;
   if (!result.ok()) {
     const std::string& description = result.error().description;
-    _errors.happened(description);
+    logPostError(_errorLine.happened(description));
     logDebug("HTTPSPostBackend(postJsonMessage): posted to %s", url.c_str());
     error = wire::makeReportingError(description, -1);
   }

@@ -10,13 +10,9 @@
 
 #include "backends/backend.h"
 #include "backends/https/json_message.h"
-#include "backends/https/post_errors.h"
 #include "backends/https/post_request.h"
 #include "http/http_client.h"
-
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
+#include "platform/limited_line.h"
 
 namespace veltrad::backends {
 
@@ -48,7 +44,7 @@ class EventPosts {
   void refusePost(VeltraBackend& backEnd, std::size_t eventCount,
                   const VeltraBackend::FlushCompletion& completion);
   // The lines that were held back: before the daemon ends.
-  void sayRest() { _errors.sayRest(); }
+  void sayRest();
 
  private:
   // Nothing: the post ended without an error.
@@ -60,7 +56,8 @@ class EventPosts {
   const platform::Clock& _clock;
   platform::Counters& _counters;
 
-  PostErrors _errors;
+  // One for all, so that many sessions make no more lines than one.
+  platform::LimitedLine _errorLine{"posts"};
 };
 
 }  // namespace veltrad::backends

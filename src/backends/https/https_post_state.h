@@ -12,7 +12,6 @@
 #include "backends/https/post_links.h"
 
 namespace veltrad::platform {
-class Counters;
 class Locale;
 }  // namespace veltrad::platform
 

@@ -6,40 +6,35 @@
 
 namespace veltrad::backends {
 
-PostLinks::PostLinks(platform::Preferences& preferences) {
-  _postURL = preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL");
+PostLinks::PostLinks(platform::Preferences& preferences)
+    : _postURL(preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL")),
+      _realtimePostURL(preferences.text(platform::kVeltraPreferenceDomain, "httpsRealtimePostURL")),
+      _useDefaultPostURL(_postURL),
+      _useDefaultRealtimePostURL(_realtimePostURL) {
   if (_postURL)
     logDebug("HTTPSPostBackend(initWithName): Using user default '%s' for postURL", _postURL->c_str());
-  _useDefaultPostURL = _postURL.has_value();
-  _realtimePostURL = preferences.text(platform::kVeltraPreferenceDomain, "httpsRealtimePostURL");
   if (_realtimePostURL) {
     logDebug("HTTPSPostBackend(initWithName): Using user default '%s' for realtimePostURL",
              _realtimePostURL->c_str());
   }
-  _useDefaultRealtimePostURL = _realtimePostURL.has_value();
 }
 
 bool PostLinks::updatePostLink(const Dictionary& entry) {
-  bool changed = false;
-  if (!(_useDefaultPostURL && _postURL)) {
-    _useDefaultPostURL = false;
-    if (const std::string* url = entry.string("post_url")) {
-      _postURL = *url;
-      logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", url->c_str());
-      changed = true;
-    }
+  const std::string* url = _useDefaultPostURL ? nullptr : entry.string("post_url");
+  if (url) {
+    _postURL = *url;
+    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", url->c_str());
   }
-  if (_useDefaultRealtimePostURL && _realtimePostURL) return changed;
-  _useDefaultRealtimePostURL = false;
-  if (const std::string* url = entry.string("realtime_post_url")) {
-    _realtimePostURL = *url;
-    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL", url->c_str());
+  if (_useDefaultRealtimePostURL) return url;
+  if (const std::string* realtime = entry.string("realtime_post_url")) {
+    _realtimePostURL = *realtime;
+    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL", realtime->c_str());
   } else {
     _realtimePostURL = _postURL;
     logDebug("HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '%s'",
              _postURL ? _postURL->c_str() : "(null)");
   }
-  return changed;
+  return url;
 }
 
 }  // namespace veltrad::backends

@@ -24,9 +24,10 @@ class PostLinks {
 
  private:
   std::optional<std::string> _postURL;
-  bool _useDefaultPostURL = false;
   std::optional<std::string> _realtimePostURL;
-  bool _useDefaultRealtimePostURL = false;
+  // From the preferences, so that no entry replaces it.
+  const bool _useDefaultPostURL;
+  const bool _useDefaultRealtimePostURL;
 };
 
 }  // namespace veltrad::backends

@@ -41,8 +41,7 @@ void MivoBackend::loadAdaptor() {
   std::string failure;
   const auto found = adaptorClassNamed(_clientBundle, VELTRA_ADAPTOR_CLASS);
   if (found.ok()) {
-    _mivoAdaptorClass = found.value();
-    _mivoAdaptor = Adaptor::make(*_mivoAdaptorClass, failure);
+    _mivoAdaptor = Adaptor::make(*found.value(), failure);
   } else {
     failure = found.error();
   }

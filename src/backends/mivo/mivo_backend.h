@@ -10,10 +10,6 @@
 #include "backends/backend.h"
 #include "backends/mivo/adaptor.h"
 
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
-
 namespace veltrad::backends {
 
 // For client types 7, 11 and 13. Where the bundle or its class is missing there is a back end all the same,
@@ -39,7 +35,6 @@ class MivoBackend final : public VeltraBackend {
   // Constant after initialisation.
   platform::Counters& _counters;
   CodeBundle& _clientBundle;
-  const veltra_adaptor_class* _mivoAdaptorClass = nullptr;
   std::unique_ptr<Adaptor> _mivoAdaptor;  // null: none could be had
 };
 

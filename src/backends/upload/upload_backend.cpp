@@ -52,13 +52,11 @@ void sayUnreadable(const std::string& path, int error) {
 std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& making,
                                                            const std::string& name, const Dictionary* profile,
                                                            const std::string& productFamily) {
-  const std::string* url = profile ? profile->string("post_url") : nullptr;
-  if (!url) {
+  if (!profile || !profile->string("post_url")) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
   std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile, productFamily));
-  backend->setUploadURL(*url);
   if (const std::string* display = profile->string("display_url")) backend->setDisplayURL(*display);
   return backend;
 }
@@ -70,12 +68,11 @@ UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name
       _http(making.http),
       _lentFiles(making.lentFiles),
       _counters(making.counters),
-      _scratchDirectory(making.scratchDirectory) {}
+      _scratchDirectory(making.scratchDirectory),
+      _uploadURL(*profile.string("post_url")) {}
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
-  const auto url = uploadURL();
-  if (!url) return false;
   const auto lent = _lentFiles.consume(extensionToken);
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
@@ -87,14 +84,14 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   }
   CompressedFile gzipped(_scratchDirectory);
   if (!compress(*file, path, gzipped)) return false;
-  auto request = uploadRequest(*url, {facts->device.udid, facts->sessionID}, path);
+  auto request = uploadRequest(_uploadURL, facts->device.udid, facts->sessionID, path);
   if (!request) {
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
     _counters.count("file lost: its upload address makes no request");
     return false;
   }
   gzipped.become(*request);
-  if (confirms(*url, _http.perform(std::move(*request)))) remove(*lent, *file, path);
+  if (confirms(_http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
 }
 
@@ -170,7 +167,7 @@ void UploadBackend::sayStopping() const {
 }
 
 // Says and counts how the exchange ended, too.
-bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& answer) const {
+bool UploadBackend::confirms(const http::HTTPResult& answer) const {
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",
              answer.ok() ? "(null)" : answer.error().description.c_str());
@@ -179,7 +176,7 @@ bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& ans
   }
   const std::string& body = answer.value().body;
   const bool text = isUTF8(body);
-  logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", url.c_str(),
+  logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", _uploadURL.c_str(),
            text ? body.c_str() : "(undecodable)");
   const bool confirmed = text && body.find(kConfirmation) != std::string::npos;
   _counters.count(confirmed ? "file uploaded" : "file not confirmed");
@@ -196,16 +193,6 @@ void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& f
   }
   _counters.count(lent.askForRemoval() ? "file confirmed: its removal was asked for"
                                        : "file confirmed: its removal could not be asked for");
-}
-
-std::optional<std::string> UploadBackend::uploadURL() const {
-  const Lock held(_urlMutex);
-  return _uploadURL;
-}
-
-void UploadBackend::setUploadURL(std::optional<std::string> value) {
-  const Lock held(_urlMutex);
-  _uploadURL = std::move(value);
 }
 
 }  // namespace veltrad::backends

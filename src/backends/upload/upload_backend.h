@@ -11,7 +11,6 @@
 #include "http/http_client.h"
 
 namespace veltrad::platform {
-class Counters;
 class LentFile;
 class LentFiles;
 }  // namespace veltrad::platform
@@ -45,10 +44,6 @@ class UploadBackend final : public VeltraBackend {
   // is asked to remove its file. Error lines say why it was not.
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
 
-  // Any thread.
-  std::optional<std::string> uploadURL() const;
-  void setUploadURL(std::optional<std::string> value);
-
  private:
   UploadBackend(const UploadMaking& making, const std::string& name, const Dictionary& profile,
                 const std::string& productFamily);
@@ -56,7 +51,7 @@ class UploadBackend final : public VeltraBackend {
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
   bool compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const;
-  bool confirms(const std::string& url, const http::HTTPResult& answer) const;
+  bool confirms(const http::HTTPResult& answer) const;
   void sayStopping() const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
@@ -66,9 +61,7 @@ class UploadBackend final : public VeltraBackend {
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
   const std::string _scratchDirectory;
-
-  mutable Mutex _urlMutex BACKEND_LOCK{LockRank::backend};
-  std::optional<std::string> _uploadURL GUARDED_BY(_urlMutex);
+  const std::string _uploadURL;
 };
 
 }  // namespace veltrad::backends
