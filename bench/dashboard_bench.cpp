@@ -1,5 +1,5 @@
-// One message to a dashboard, built, printed, handed over and sent, beside a bare send of the same bytes.
-// Prints CPU microseconds each; a thread drains the server's socket.
+// Compares a message to a dashboard (packet, text line, queue and send) with a bare send of the same bytes.
+// Prints CPU microseconds of each. A thread reads from the server's socket.
 #include <arpa/inet.h>
 #include <fmt/format.h>
 #include <netinet/in.h>
@@ -52,8 +52,11 @@ int main() {
       getsockname(server, reinterpret_cast<sockaddr*>(&address), &length) != 0)
     return 1;
   World world;
-  const Dictionary section{{"ip", "127.0.0.1"}, {"port", int{ntohs(address.sin_port)}}};
-  const auto backend = world.factory.newBackendWithName(wire::kVeltraBackendDashboard, section, "Elm", 7);
+  config::DashboardProfile section;
+  section.ip = "127.0.0.1";
+  section.port = ntohs(address.sin_port);
+  const auto backend = world.factory.newBackendWithName(
+      wire::kVeltraBackendDashboard, std::make_shared<const config::Profile>(section), "Elm", 7);
   if (!backend) return 1;
   backends::SessionFacts facts;
   facts.compType = 7;

@@ -76,7 +76,6 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
   // Constant after construction.
   const std::string& name() const { return _name; }
-  const Dictionary& profile() const { return *_profile; }
   const std::string& productFamily() const { return _productFamily; }
   double samplingFactor() const { return _samplingFactor; }  // in [0, 1), drawn once
   const std::optional<std::string>& displayURL() const { return _displayURL; }
@@ -94,13 +93,12 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
  protected:
   // Stores copies and draws the sampling factor. The kinds' initWithName(…) come here.
-  VeltraBackend(std::string name, Dictionary profile, std::string productFamily, platform::Random& random);
+  VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
 
  private:
   // Constant after construction.
   const std::string _name;
-  const SharedDictionary _profile;
   const std::string _productFamily;
   const double _samplingFactor;
   std::optional<std::string> _displayURL;

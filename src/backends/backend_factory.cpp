@@ -18,35 +18,35 @@ constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 }  // namespace
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
-    const std::string& name, const Value& profile, const std::optional<std::string>& productFamily,
+    const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
-  const Dictionary* section = profile.asDictionary();
   const std::string family = productFamily.value_or("");
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName(
         {_services.random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner},
-        name, section, family);
+        name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
                                         _services.counters, _services.scratchDirectory},
-                                       name, section, family);
+                                       name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
-    return HTTPSPostBackend::initWithName({_services.random,
-                                           _services.locale,
-                                           _services.counters,
-                                           _posts,
-                                           {_services.preferences, _services.library, _services.settings}},
-                                          name, section, productFamily);
+    return HTTPSPostBackend::initWithName(
+        {_services.random,
+         _services.locale,
+         _services.counters,
+         _posts,
+         {_services.preferences, _services.library, _services.settings}},
+        name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
     return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
-                                       section, family);
+                                       family);
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
-                                     section, family, clientType);
+                                     family, clientType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -10,6 +10,7 @@
 #include "backends/dashboard/log_data_uploads.h"
 #include "backends/https/event_posts.h"
 #include "backends/upload/file_uploads.h"
+#include "config/storebag_content.h"
 
 namespace veltrad::config {
 class ProcessSettings;
@@ -58,14 +59,18 @@ struct BackendServices {
   std::string scratchDirectory = "/tmp";  // for files without a name
 };
 
+// Null: its back end reads nothing of it.
+using SharedProfile = std::shared_ptr<const config::Profile>;
+
 class BackendFactory {
  public:
   explicit BackendFactory(BackendServices services)
       : _services(services),
         _posts(services.http, services.clock, services.counters),
         _logData(services.http, services.counters) {}
-  // Null: no such backend here, or it cannot work with this profile; one line has said so.
-  std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
+  // Null: no such backend here, or it cannot work with this profile; one line has said so. `profile` as the
+  // section of a storebag has it under the name.
+  std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType, const BackendOwner& owner = {});
   // The lines that were held back: before the daemon ends.

@@ -1,32 +1,30 @@
 // Picks from a client type's storebag the section of the process's environment. The caller's thread.
 #include "config/storebag_section.h"
 
-#include <algorithm>
-#include <limits>
+#include <iterator>
 
 #include "config/client_types.h"
 #include "config/process_settings.h"
+#include "config/storebag_content.h"
 #include "platform/log.h"
 
 namespace veltrad::config {
 namespace {
 
 constexpr std::uint32_t kSeedEnvironment = 3;
+constexpr std::uint32_t kReleaseEnvironment = 4;
 
-const Dictionary* sectionOf(const Dictionary& storebag, std::uint32_t environment, const char* name) {
-  const Dictionary* section = name != nullptr ? storebag.dictionary(name) : nullptr;
-  if (section != nullptr || environment != kSeedEnvironment) return section;
-  logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
-  return storebag.dictionary("release");
-}
-
-std::optional<std::int32_t> refreshCycleOf(const Dictionary& storebag) {
-  const Value* entry = storebag.find("refresh_cycle");
-  const std::optional<std::int64_t> seconds = entry != nullptr ? entry->toInt64() : std::nullopt;
-  if (!seconds) return std::nullopt;
-  constexpr std::int64_t kLeast = std::numeric_limits<std::int32_t>::min();
-  constexpr std::int64_t kMost = StorebagSections::kMostRefreshCycleSeconds;
-  return static_cast<std::int32_t>(std::clamp(*seconds, kLeast, kMost));
+// By the number of its environment; null: none.
+const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
+  const std::optional<Dictionary>* sections[] = {&storebag.development, &storebag.flornInternal,
+                                                 &storebag.seed, &storebag.release};
+  const std::uint32_t place = environment - 1;
+  if (place >= std::size(sections)) return nullptr;
+  if (environment == kSeedEnvironment && !storebag.seed) {
+    logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
+    return sectionOf(storebag, kReleaseEnvironment);
+  }
+  return *sections[place] ? &**sections[place] : nullptr;
 }
 
 }  // namespace
@@ -35,44 +33,44 @@ StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _settings(settings), _download(http, settings, veltra) {}
 
-std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClientType(
+std::shared_ptr<const StorebagSection> StorebagSections::fetchStorebagForEnvironmentAndClientType(
     std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
     std::optional<std::string>* lastModified, bool& attempted) {
   const char* name = storebagNameForClientType(clientType);
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return std::nullopt;
+    return nullptr;
   }
-  const std::optional<Dictionary> storebag =
+  const std::optional<Dictionary> fetched =
       _download.fetchStorebagWithName(name, maxAge, notModified, lastModified, attempted);
-  if (!storebag) {
+  if (!fetched) {
     if (!notModified && attempted)
       logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
                clientType);
-    return std::nullopt;
+    return nullptr;
   }
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
     attempted = false;
-    return std::nullopt;
+    return nullptr;
   }
-  const char* sectionName = sectionNameForEnvironment(*environment);
-  const Dictionary* section = sectionOf(*storebag, *environment, sectionName);
+  const auto storebag = parsed<Storebag>(*fetched);
+  const Dictionary* section = sectionOf(storebag, *environment);
   if (section == nullptr) {
+    const char* sectionName = sectionNameForEnvironment(*environment);
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
-    return std::nullopt;
+    return nullptr;
   }
-  const std::string* text = storebag->string("version");
-  version = text != nullptr ? std::optional(*text) : std::nullopt;
-  if (const auto cycle = refreshCycleOf(*storebag)) {
-    maxAge = *cycle;
+  version = storebag.version;
+  if (storebag.refreshCycle) {
+    maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
     logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", maxAge);
   }
-  return *section;
+  return parseSection(*section);
 }
 
 }  // namespace veltrad::config

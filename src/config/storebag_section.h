@@ -10,12 +10,9 @@ namespace veltrad::config {
 // the constructor takes must outlive it.
 class StorebagSections final : public StorebagSource {
  public:
-  // A cached copy stays fresh at most this long on the storebag's own word ("refresh_cycle").
-  static constexpr std::int32_t kMostRefreshCycleSeconds = 86'400;
-
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
+  std::shared_ptr<const StorebagSection> fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
       std::optional<std::string>* lastModified, bool& attempted) override;
 

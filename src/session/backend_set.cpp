@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "backends/backend_factory.h"
+#include "config/storebag_content.h"
 #include "platform/clock.h"
 #include "platform/log.h"
 #include "support/device_identity.h"
@@ -12,7 +13,8 @@
 
 namespace veltrad::session {
 
-std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
+std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
+                                                 const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo,
                                                  backends::SessionFacts facts) {
   if (!storebag) {
@@ -39,7 +41,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, co
 
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   const auto made = std::make_shared<BackendSet>();
-  for (const auto& [name, profile] : *storebag) {
+  for (const auto& [name, profile] : storebag->backends) {
     const auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared->compType,
                                                            {making.account, making.oneShot});
     if (!backend) continue;

@@ -13,6 +13,10 @@ namespace veltrad::backends {
 class BackendFactory;
 }  // namespace veltrad::backends
 
+namespace veltrad::config {
+struct StorebagSection;
+}  // namespace veltrad::config
+
 namespace veltrad::platform {
 class Clock;
 class MemoryAccount;
@@ -40,7 +44,8 @@ struct BackendMaking {
 // One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,
 // with one error line, without a storebag or without session info. `facts` has the user info, the device's
 // identifier and the session's ID, where it has one; the rest is found out here.
-std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
+std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
+                                                 const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
 
 // The names of those in state 2 or 3.

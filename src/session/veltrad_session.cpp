@@ -103,7 +103,7 @@ bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::
 bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDictionary& kept) {
   if (!given) return true;
   kept = keptInfo(std::move(*given), _account);
-  if (!kept) _services.counters.count("session or user info refused: its user keeps too much");
+  if (!kept) _services.counters.count(wire::Reason::info_over_share);
   return kept != nullptr;
 }
 
@@ -120,9 +120,9 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
-  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
-    _services.counters.count("start without back ends: no storebag");
+    _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
     return;
   }
@@ -137,7 +137,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
+void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   const backends::SharedDictionary info = sessionInfo();
   // It may have been out of reach when the client connected.

@@ -11,7 +11,7 @@ namespace veltrad {
 namespace {
 
 struct Counting final : backends::VeltraBackend {
-  explicit Counting(platform::Random& random) : backends::VeltraBackend("x", {}, "", random) {}
+  explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
   std::optional<std::string> sendNumberedMessage(const backends::NumberedMessage& message) override {
     return std::to_string(message.eventID);
   }

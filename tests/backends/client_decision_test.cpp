@@ -22,23 +22,29 @@ TEST(ClientDecision, HoldsAtItsBorders) {
                  Dictionary{{"country", Array{"AT", "DE"}}, {"threshold", std::move(threshold)}},
                  Dictionary{{"country", Array{"DE"}}, {"threshold", 0.0}}};
   };
-  using enum backends::ClientRefusal;
-  const std::tuple<Dictionary, backends::ClientFacts, std::int32_t, backends::ClientRefusal> cases[] = {
+  using enum wire::Reason;
+  constexpr auto none = std::nullopt;
+  const std::tuple<Dictionary, backends::ClientFacts, std::int32_t, std::optional<wire::Reason>> cases[] = {
       {{}, nowhere, 2, none},
-      {{{"device_blacklist", Array{"x"}}}, nothing, 1, deviceListed},
+      {{{"device_blacklist", Array{"x"}}}, nothing, 1, device_refused},
       {{{"sampling_threshold", equal}}, facts, 2, none},
-      {{{"sampling_threshold", below}}, facts, 3, none},
-      {{{"sampling_threshold", below}, {"override_sampling", 0.29}}, facts, 1, sampledOut},
-      {{{"sampling_threshold", below}, {"override_sampling", equal}}, facts, 3, none},
-      {{{"per_country_sampling_thresholds", country(0.1)}}, facts, 3, none},
-      {{{"per_country_sampling_thresholds", country("x")}}, facts, 1, thresholdMissing}};
-  for (const auto& [changes, who, state, refusal] : cases) {
+      {{{"sampling_threshold", below}}, facts, 3, held_by_sampling},
+      {{{"sampling_threshold", below}, {"override_sampling", 0.29}}, facts, 1, sampled_out},
+      {{{"sampling_threshold", below}, {"override_sampling", equal}}, facts, 3, held_by_sampling},
+      {{{"per_country_sampling_thresholds", country(0.1)}}, facts, 3, held_by_sampling},
+      {{{"per_country_sampling_thresholds", country("x")}}, facts, 1, no_threshold}};
+  for (const auto& [changes, who, state, reason] : cases) {
     Dictionary entry{{"locale_whitelist", Array{"de"}}, {"filters", Array{}}, {"sampling_threshold", 0.5}};
     entry.merge(changes);
-    const backends::ClientVerdict verdict = backends::decideOnClient(entry, who);
+    const backends::ClientVerdict verdict =
+        backends::decideOnClient(config::parsed<config::ClientEntry>(entry), who);
     EXPECT_EQ(verdict.state, state) << formats::writeJSON(changes);
-    EXPECT_EQ(verdict.refusal, refusal) << formats::writeJSON(changes);
+    EXPECT_TRUE(verdict.reason == reason) << formats::writeJSON(changes);
   }
+}
+
+config::Filters parsed(const Array& filters) {
+  return *config::parsed<config::ClientEntry>({{"filters", filters}}).filters;
 }
 
 TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
@@ -55,16 +61,18 @@ TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
       {{Dictionary{{"action", "remove"}}, "junk"}, event, event},
       {{filter("n", "remove", {{"method", 0}, {"status", 0}})}, {{"n", 1}}, {}}};
   for (const auto& [filters, before, after] : rows) {
+    const auto given = parsed(filters);
     backends::FilterTable table;
-    table.createFiltersFromArray(filters);
+    table.createFiltersFromArray(given);
     table.createFiltersFromArray({});
     Dictionary filtered = before;
     table.filterEvent(filtered);
     EXPECT_EQ(filtered, after) << formats::writeJSON(filters);
   }
+  const auto first = parsed({filter("mac", "remove")}), second = parsed({filter("other", "remove")});
   backends::FilterTable table;
-  table.createFiltersFromArray({filter("mac", "remove")});
-  table.createFiltersFromArray({filter("other", "remove")});
+  table.createFiltersFromArray(first);
+  table.createFiltersFromArray(second);
   Dictionary kept = event;
   EXPECT_EQ(table.filterEvent(kept).removed, 0u);
 }

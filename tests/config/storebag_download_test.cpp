@@ -7,6 +7,7 @@
 #include <climits>
 
 #include "config/storebag_container.h"
+#include "config/storebag_content.h"
 #include "config/storebag_section.h"
 #include "configuration.h"
 #include "formats/property_list.h"
@@ -128,8 +129,9 @@ struct Choice {
     configuration.answers(container(formats::writeXMLPropertyList(storebag)),
                           {{"Cache-Control", cacheControl}});
     config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
-    section = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified, nullptr,
-                                                                attempted);
+    const auto chosen = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified,
+                                                                          nullptr, attempted);
+    if (chosen) section = chosen->asGiven;
   }
   std::optional<Dictionary> section;
   std::int32_t maxAge = -77;

@@ -13,23 +13,18 @@ constexpr const char* kEnergyLogEvent = "Sonvaird-VLT";
 
 std::shared_ptr<AmperyBackend> AmperyBackend::initWithName(EnergyLog& energyLog, platform::Counters& counters,
                                                            platform::Random& random, const std::string& name,
-                                                           const Dictionary* profile,
                                                            const std::string& productFamily) {
-  return std::shared_ptr<AmperyBackend>(
-      new AmperyBackend(energyLog, counters, random, name, profile, productFamily));
+  return std::shared_ptr<AmperyBackend>(new AmperyBackend(energyLog, counters, random, name, productFamily));
 }
 
 AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,
-                             const std::string& name, const Dictionary* profile,
-                             const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, random),
-      _energyLog(energyLog),
-      _counters(counters) {}
+                             const std::string& name, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
 std::optional<std::string> AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
   if (message.method == 0 || !message.payload || message.payload->empty()) {
-    _counters.count(message.method == 0 ? "message without energy event: its category is 0"
-                                        : "message without energy event: its payload is empty");
+    _counters.count(message.method == 0 ? wire::Reason::energy_category_zero
+                                        : wire::Reason::energy_payload_empty);
     return std::nullopt;
   }
   Dictionary event = *message.payload;

@@ -16,7 +16,6 @@ class AmperyBackend final : public VeltraBackend {
  public:
   static std::shared_ptr<AmperyBackend> initWithName(EnergyLog& energyLog, platform::Counters& counters,
                                                      platform::Random& random, const std::string& name,
-                                                     const Dictionary* profile,
                                                      const std::string& productFamily);
 
   // Nothing, always. The event is the payload, with "method", "respCode" and "event" (the event ID) set.
@@ -24,7 +23,7 @@ class AmperyBackend final : public VeltraBackend {
 
  private:
   AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,
-                const std::string& name, const Dictionary* profile, const std::string& productFamily);
+                const std::string& name, const std::string& productFamily);
 
   // Constant after construction.
   EnergyLog& _energyLog;

@@ -12,19 +12,19 @@
 namespace veltrad::backends {
 
 namespace {
-const char* reasonOf(http::HTTPError::Kind kind) {
+wire::Reason reasonOf(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
     case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
-      return "event lost: the post failed";
+      return wire::Reason::post_failed;
     case http::HTTPError::Kind::tooMany:
-      return "event lost: too many posts under way";
+      return wire::Reason::too_many_posts;
     case http::HTTPError::Kind::shortage:
-      return "event lost: no descriptor, thread or memory for its post";
+      return wire::Reason::post_shortage;
     case http::HTTPError::Kind::stopping:
-      return "event lost: the daemon stopped before the post ended";
+      return wire::Reason::post_stopped;
   }
-  return "event lost: the post failed";
+  return wire::Reason::post_failed;
 }
 
 void logPostError(const std::optional<std::string>& text) {
@@ -37,7 +37,7 @@ void EventPosts::sayRest() {
 }
 
 void EventPosts::restrict(Dictionary& event) const {
-  _counters.count("event field removed: JSON cannot carry it", restrictEventForJSON(event));
+  _counters.count(wire::Reason::field_not_json, restrictEventForJSON(event));
 }
 
 JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> events,
@@ -50,7 +50,7 @@ JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> e
 void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
                                  const std::optional<std::string>& url, Post post) {
   if (!url) {
-    _counters.count("event lost: postURL is nil", post.eventCount);
+    _counters.count(wire::Reason::post_url_nil, post.eventCount);
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return;
   }

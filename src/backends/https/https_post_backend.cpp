@@ -23,14 +23,16 @@ bool meansSamplingOverride(std::int32_t flag) {
 }  // namespace
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
-    const HTTPSPostMaking& making, const std::string& name, const Dictionary* profile,
+    const HTTPSPostMaking& making, const std::string& name,
+    std::shared_ptr<const config::HTTPSPostProfile> profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
-  if (!profile->array("clients")) {
+  if (!profile->clients) {
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, *profile, *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(
+      new HTTPSPostBackend(making, name, std::move(profile), *productFamily));
   if (!made->_clientState.identity().known()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -39,15 +41,15 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   const Dictionary& profile, const std::string& productFamily)
-    : VeltraBackend(name, profile, productFamily, making.random),
+                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
+                                   const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
       _counters(making.counters),
       _posts(making.posts),
-      _clientState(*this, making.locale, making.counters, making.identity),
+      _clientState(*this, profile, making.locale, making.counters, making.identity),
       _held(std::make_shared<HeldEvents>(making.counters)) {
-  const std::string* displayURL = profile.string("display_url");
-  if (displayURL) setDisplayURL(*displayURL);
+  setDisplayURL(profile->displayURL);
 }
 
 void HTTPSPostBackend::updateState() {
@@ -56,7 +58,7 @@ void HTTPSPostBackend::updateState() {
 
 std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
   if (state() == kBackendDisabled) {
-    _counters.count("event dropped: the back end is disabled");
+    _counters.count(wire::Reason::backend_disabled);
     return std::nullopt;
   }
   const std::uint64_t sessionIDChanges = _held->sessionIDChanges();  // before the facts are taken
@@ -141,8 +143,8 @@ Dictionary HTTPSPostBackend::withStopFields(const Dictionary& payload, bool batc
 
 void HTTPSPostBackend::filterEvent(Dictionary& event) const {
   const FilterTable::Outcome outcome = _clientState.filters().filterEvent(event);
-  if (outcome.removed > 0) _counters.count("event field removed: by a filter", outcome.removed);
-  if (outcome.hashed > 0) _counters.count("event field hashed: by a filter", outcome.hashed);
+  if (outcome.removed > 0) _counters.count(wire::Reason::field_removed, outcome.removed);
+  if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
 std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
@@ -164,25 +166,24 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platfo
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  const bool kept = keep(std::move(event), size, method, account, sessionIDChanges);
-  _counters.count(kept ? "event held: batched" : "event dropped: its user keeps too much");
+  _counters.count(keep(std::move(event), size, method, account, sessionIDChanges));
   return flushed;
 }
 
-// False: there is no room for it, even without what the user's other batches hold.
-bool HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
-                            platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
+// Batched, or there is no room for it, even without what the user's other batches hold.
+wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
+                                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
   auto charge = account ? account->keep(size.charged) : platform::Charge();
-  if (!charge) return false;
+  if (!charge) return wire::Reason::event_over_share;
   if (account && !std::exchange(_evictable, true)) account->add(_held);
   _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
              sessionIDChanges);
-  return true;
+  return wire::Reason::event_batched;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (state() != kBackendReporting) {
-    _counters.count("event dropped: flushed while the back end does not report", _held->discard());
+    _counters.count(wire::Reason::flushed_unreported, _held->discard());
   }
   if (_held->empty()) {
     if (completion) completion(std::nullopt, wire::makeReportingError("Nothing to flush", -1));

@@ -28,9 +28,10 @@ struct HTTPSPostMaking {
 class HTTPSPostBackend final : public VeltraBackend {
  public:
   // Null without a profile, a product family or the profile's "clients" (one error line).
-  static std::shared_ptr<HTTPSPostBackend> initWithName(const HTTPSPostMaking& making,
-                                                        const std::string& name, const Dictionary* profile,
-                                                        const std::optional<std::string>& productFamily);
+  static std::shared_ptr<HTTPSPostBackend> initWithName(
+      const HTTPSPostMaking& making, const std::string& name,
+      std::shared_ptr<const config::HTTPSPostProfile> profile,
+      const std::optional<std::string>& productFamily);
 
   void updateState() override;
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
@@ -38,15 +39,15 @@ class HTTPSPostBackend final : public VeltraBackend {
   void setCorrelatedSessionID(const std::string& sessionID) override;
 
  private:
-  HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name, const Dictionary& profile,
-                   const std::string& productFamily);
+  HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
+                   std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
   Dictionary withStopFields(const Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;
   std::optional<std::string> batchEvent(Dictionary event, platform::MemoryAccount* account,
                                         std::uint64_t sessionIDChanges);
-  bool keep(Dictionary event, const EventSize& size, std::int32_t method, platform::MemoryAccount* account,
-            std::uint64_t sessionIDChanges);
+  wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
+                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   std::optional<std::string> postEvent(Dictionary event, const SessionFacts& facts,
                                        const NumberedMessage& message);
   JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const;

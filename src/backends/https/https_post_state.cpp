@@ -1,6 +1,8 @@
 // Whether and how the back end reports for the current client.
 #include "backends/https/https_post_state.h"
 
+#include <algorithm>
+
 #include "backends/https/text_lists.h"
 #include "formats/json.h"
 #include "platform/counters.h"
@@ -17,47 +19,40 @@ std::optional<std::string> optionalText(const std::string* text) {
 }  // namespace
 
 std::int32_t HTTPSPostState::updateBackendState() {
-  const Array* clients = _backEnd.profile().array("clients");
-  if (!clients) return kBackendDisabled;
   const auto facts = _backEnd.facts();
   const SharedDictionary& userInfo = facts->userInfo;
   const auto clientName =
       optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoClientName) : nullptr);
   const auto serviceName =
       optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoServiceName) : nullptr);
-  const Dictionary* entry = nullptr;
-  for (const Value& client : *clients) {
-    const Dictionary* candidate = client.asDictionary();
-    if (!candidate || !matchClientNameAndServiceID(*candidate, clientName, serviceName)) continue;
-    entry = candidate;
-    break;
-  }
-  if (entry) applyExpedite(*entry);
-  if (!facts->requireUserInfo) return reportForEveryone(*clients);
+  const auto& clients = *_profile->clients;
+  const auto entry = std::find_if(clients.begin(), clients.end(), [&](const config::ClientEntry& candidate) {
+    return matchClientNameAndServiceID(candidate, clientName, serviceName);
+  });
+  const bool found = entry != clients.end();
+  if (found) applyExpedite(*entry);
+  if (!facts->requireUserInfo) return reportForEveryone();
   if (!userInfo) {
-    _counters.count("back end waiting: user info is required, and there is none");
+    _counters.count(wire::Reason::waits_for_user_info);
     return kBackendWaiting;
   }
-  if (!entry) {
-    _counters.count("back end disabled: no client entry fits");
+  if (!found) {
+    _counters.count(wire::Reason::no_entry);
     return kBackendDisabled;
   }
   return reportForClient(*entry, clientName, serviceName);
 }
 
-std::int32_t HTTPSPostState::reportForEveryone(const Array& clients) {
-  const Dictionary* taken = nullptr;
-  for (const Value& client : clients) {
-    const Dictionary* entry = client.asDictionary();
-    if (!entry || !_links.updatePostLink(*entry)) continue;
-    taken = entry;
-    break;
-  }
-  resetBackendStateWithClient(taken);
+std::int32_t HTTPSPostState::reportForEveryone() {
+  const auto& clients = *_profile->clients;
+  const auto taken =
+      std::find_if(clients.begin(), clients.end(),
+                   [this](const config::ClientEntry& candidate) { return _links.updatePostLink(candidate); });
+  resetBackendStateWithClient(taken == clients.end() ? nullptr : &*taken);
   return kBackendReporting;
 }
 
-std::int32_t HTTPSPostState::reportForClient(const Dictionary& entry,
+std::int32_t HTTPSPostState::reportForClient(const config::ClientEntry& entry,
                                              const std::optional<std::string>& clientName,
                                              const std::optional<std::string>& serviceName) {
   const auto country = _locale.countryCode();
@@ -68,16 +63,15 @@ std::int32_t HTTPSPostState::reportForClient(const Dictionary& entry,
   _identity.setDNUType(verdict.dnuType);
   if (verdict.filters) _filters.createFiltersFromArray(*verdict.filters);
   if (verdict.samplingReached) takeSampling(verdict, country);
-  if (verdict.refusal != ClientRefusal::none) {
+  if (verdict.reason) {
     logRefusal(entry, verdict, country);
-    _counters.count(reasonOf(verdict.refusal));
+    _counters.count(*verdict.reason);
   }
-  if (verdict.state == kBackendHeld) _counters.count("back end held: sampled out, may be overridden");
   if (!verdict.samplingReached) return kBackendDisabled;
 
   resetBackendStateWithClient(&entry);
-  if (entry.contains("custom_clientId") && !_identity.takeCustomClientID(clientName, serviceName)) {
-    _counters.count("back end disabled: its client's identifier cannot be read");
+  if (entry.customClientID && !_identity.takeCustomClientID(clientName, serviceName)) {
+    _counters.count(wire::Reason::no_identifier);
     return kBackendDisabled;
   }
   logDebug(
@@ -90,36 +84,33 @@ std::int32_t HTTPSPostState::reportForClient(const Dictionary& entry,
   return verdict.state;
 }
 
-void HTTPSPostState::logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                                 const std::optional<std::string>& country) const {
-  const auto printed = [&entry](const char* key) {
-    const Value* list = entry.find(key);
-    return list ? formats::writeJSON(*list) : std::string("(null)");
+  const auto printed = [](const config::TextList& list) {
+    return list.asGiven ? formats::writeJSON(*list.asGiven) : std::string("(null)");
   };
-  switch (verdict.refusal) {
-    case ClientRefusal::consentMissing:
+  switch (*verdict.reason) {
+    case wire::Reason::no_consent:
       logDebug("HTTPSPostBackend(updateBackendState): reporting disabled by DNU: %d.", verdict.overrideDNU);
       break;
-    case ClientRefusal::countryNotListed:
+    case wire::Reason::country_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in country code list %s",
-               country ? country->c_str() : "(null)", printed("locale_whitelist").c_str());
+               country ? country->c_str() : "(null)", printed(entry.localeWhitelist).c_str());
       break;
-    case ClientRefusal::deviceNotListed:
+    case wire::Reason::device_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
-               _backEnd.productFamily().c_str(), printed("device_whitelist").c_str());
+               _backEnd.productFamily().c_str(), printed(entry.deviceWhitelist).c_str());
       break;
-    case ClientRefusal::deviceListed: {
+    case wire::Reason::device_refused: {
       const auto hardwareType = _backEnd.facts()->device.hardwareType;
       logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
-               hardwareType ? hardwareType->c_str() : "(null)", printed("device_blacklist").c_str());
+               hardwareType ? hardwareType->c_str() : "(null)", printed(entry.deviceBlacklist).c_str());
       break;
     }
-    case ClientRefusal::filtersMissing:
+    case wire::Reason::no_filters:
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;
-    case ClientRefusal::none:
-    case ClientRefusal::thresholdMissing:
-    case ClientRefusal::sampledOut:
+    default:
       break;  // the line of the state says it
   }
 }
@@ -134,17 +125,16 @@ void HTTPSPostState::takeSampling(const ClientVerdict& verdict, const std::optio
   if (verdict.overrideReached) _overrideSampling = verdict.overrideSampling;
 }
 
-void HTTPSPostState::applyExpedite(const Dictionary& entry) {
-  const auto expedite = entry.real("expedite");
-  if (!expedite) return;
-  _batchEvents = *expedite == 0;
+void HTTPSPostState::applyExpedite(const config::ClientEntry& entry) {
+  if (!entry.expedite) return;
+  _batchEvents = *entry.expedite == 0;
   logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", *_batchEvents);
 }
 
-void HTTPSPostState::resetBackendStateWithClient(const Dictionary* entry) {
-  _eventThreshold = entry ? entry->int32("event_threshold").value_or(0) : 0;
+void HTTPSPostState::resetBackendStateWithClient(const config::ClientEntry* entry) {
+  _eventThreshold = entry ? entry->eventThreshold : 0;
   logDebug("resetBackendStateWithClient: event_threshold set to %d", _eventThreshold);
-  const std::int32_t extras = entry ? entry->int32("extras_on_internal").value_or(0) : 0;
+  const std::int32_t extras = entry ? entry->extrasOnInternal : 0;
   _identity.setExtrasOnInternal(extras);
   logDebug("setBackendStateWithClient: extras on internal is set to %d", extras);
 }

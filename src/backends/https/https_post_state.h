@@ -2,14 +2,17 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include "backends/backend.h"
 #include "backends/https/client_decision.h"
 #include "backends/https/filter_table.h"
 #include "backends/https/post_identity.h"
 #include "backends/https/post_links.h"
+#include "config/storebag_content.h"
 
 namespace veltrad::platform {
 class Locale;
@@ -17,13 +20,16 @@ class Locale;
 
 namespace veltrad::backends {
 
-// Part of its back end, which it reads its section and its facts from, and tells hierarchy and sampling
+// Part of its back end, which it reads the facts from, and tells hierarchy and sampling
 // threshold. What a run does not reach stays as an earlier one has left it.
 class HTTPSPostState {
  public:
-  HTTPSPostState(VeltraBackend& backEnd, platform::Locale& locale, platform::Counters& counters,
+  // `profile` has "clients".
+  HTTPSPostState(VeltraBackend& backEnd, std::shared_ptr<const config::HTTPSPostProfile> profile,
+                 platform::Locale& locale, platform::Counters& counters,
                  const PostIdentity::Sources& identity)
       : _backEnd(backEnd),
+        _profile(std::move(profile)),
         _locale(locale),
         _counters(counters),
         _identity(identity),
@@ -40,17 +46,18 @@ class HTTPSPostState {
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
 
  private:
-  void applyExpedite(const Dictionary& entry);
-  std::int32_t reportForEveryone(const Array& clients);
-  std::int32_t reportForClient(const Dictionary& entry, const std::optional<std::string>& clientName,
+  void applyExpedite(const config::ClientEntry& entry);
+  std::int32_t reportForEveryone();
+  std::int32_t reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
                                const std::optional<std::string>& serviceName);
-  void logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+  void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                   const std::optional<std::string>& country) const;
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
-  void resetBackendStateWithClient(const Dictionary* entry);
+  void resetBackendStateWithClient(const config::ClientEntry* entry);
 
   // Constant after construction.
   VeltraBackend& _backEnd;
+  const std::shared_ptr<const config::HTTPSPostProfile> _profile;
   platform::Locale& _locale;
   platform::Counters& _counters;
 

@@ -19,22 +19,23 @@ PostLinks::PostLinks(platform::Preferences& preferences)
   }
 }
 
-bool PostLinks::updatePostLink(const Dictionary& entry) {
-  const std::string* url = _useDefaultPostURL ? nullptr : entry.string("post_url");
-  if (url) {
-    _postURL = *url;
-    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", url->c_str());
+bool PostLinks::updatePostLink(const config::ClientEntry& entry) {
+  const bool changed = !_useDefaultPostURL && entry.postURL;
+  if (changed) {
+    _postURL = entry.postURL;
+    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", _postURL->c_str());
   }
-  if (_useDefaultRealtimePostURL) return url;
-  if (const std::string* realtime = entry.string("realtime_post_url")) {
-    _realtimePostURL = *realtime;
-    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL", realtime->c_str());
+  if (_useDefaultRealtimePostURL) return changed;
+  if (entry.realtimePostURL) {
+    _realtimePostURL = entry.realtimePostURL;
+    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL",
+             _realtimePostURL->c_str());
   } else {
     _realtimePostURL = _postURL;
     logDebug("HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '%s'",
              _postURL ? _postURL->c_str() : "(null)");
   }
-  return url;
+  return changed;
 }
 
 }  // namespace veltrad::backends

@@ -5,7 +5,7 @@
 #include <optional>
 #include <string>
 
-#include "base/value.h"
+#include "config/client_entry.h"
 
 namespace veltrad::platform {
 class Preferences;
@@ -18,7 +18,7 @@ class PostLinks {
   explicit PostLinks(platform::Preferences& preferences);
 
   // True when the entry's "post_url" was taken.
-  bool updatePostLink(const Dictionary& entry);
+  bool updatePostLink(const config::ClientEntry& entry);
   const std::optional<std::string>& postURL() const { return _postURL; }
   const std::optional<std::string>& realtimePostURL() const { return _realtimePostURL; }
 

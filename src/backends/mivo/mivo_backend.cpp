@@ -17,11 +17,9 @@ bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
 
 std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platform::Counters& counters,
                                                        platform::Random& random, const std::string& name,
-                                                       const Dictionary* profile,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(
-      new MivoBackend(bundle, counters, random, name, profile, productFamily));
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(bundle, counters, random, name, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -32,10 +30,8 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platf
 }
 
 MivoBackend::MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
-                         const std::string& name, const Dictionary* profile, const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, random),
-      _counters(counters),
-      _clientBundle(bundle) {}
+                         const std::string& name, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, random), _counters(counters), _clientBundle(bundle) {}
 
 void MivoBackend::loadAdaptor() {
   std::string failure;
@@ -52,8 +48,7 @@ std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessag
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
-    _counters.count(_mivoAdaptor ? "message dropped: the adaptor does not take messages"
-                                 : "message dropped: there is no adaptor");
+    _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
     return std::nullopt;
   }
   const auto thrown =
@@ -62,7 +57,7 @@ std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessag
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
   }
-  _counters.count(thrown ? "message lost: the adaptor threw" : "message handed to the adaptor");
+  _counters.count(thrown ? wire::Reason::adaptor_threw : wire::Reason::handed_to_adaptor);
   return std::nullopt;
 }
 

@@ -19,7 +19,6 @@ class MivoBackend final : public VeltraBackend {
   // Null for a client type that has no adaptor; one error line has said so.
   static std::shared_ptr<MivoBackend> initWithName(CodeBundle& bundle, platform::Counters& counters,
                                                    platform::Random& random, const std::string& name,
-                                                   const Dictionary* profile,
                                                    const std::string& productFamily, std::int32_t clientType);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
@@ -29,7 +28,7 @@ class MivoBackend final : public VeltraBackend {
 
  private:
   MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
-              const std::string& name, const Dictionary* profile, const std::string& productFamily);
+              const std::string& name, const std::string& productFamily);
   void loadAdaptor();
 
   // Constant after initialisation.

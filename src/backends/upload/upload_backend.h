@@ -8,6 +8,7 @@
 
 #include "backends/backend.h"
 #include "backends/upload/file_snapshot.h"
+#include "config/storebag_content.h"
 #include "http/http_client.h"
 
 namespace veltrad::platform {
@@ -37,7 +38,7 @@ class UploadBackend final : public VeltraBackend {
   // From a storebag's section: "post_url" (without a query), and where given "display_url". Null, after one
   // error line, without the first.
   static std::shared_ptr<UploadBackend> initWithName(const UploadMaking& making, const std::string& name,
-                                                     const Dictionary* profile,
+                                                     const config::UploadProfile* profile,
                                                      const std::string& productFamily);
 
   // True when the request was carried out, whatever became of it: the answer alone decides whether the client
@@ -45,7 +46,7 @@ class UploadBackend final : public VeltraBackend {
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
 
  private:
-  UploadBackend(const UploadMaking& making, const std::string& name, const Dictionary& profile,
+  UploadBackend(const UploadMaking& making, const std::string& name, const std::string& uploadURL,
                 const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
