@@ -10,6 +10,7 @@
 #include <string>
 #include <string_view>
 
+#include "backends/lock_ranks.h"
 #include "backends/session_facts.h"
 #include "base/mutex.h"
 #include "base/value.h"
@@ -110,7 +111,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::atomic<std::int32_t> _state{kBackendWaiting};
   std::atomic<std::int32_t> _hierarchy{0};
 
-  mutable Mutex _mutex BACKEND_LOCK{LockRank::backend};
+  mutable Mutex _mutex BACKEND_LOCK;
   std::shared_ptr<const SessionFacts> _facts GUARDED_BY(_mutex) = std::make_shared<const SessionFacts>();
   std::optional<double> _samplingThreshold GUARDED_BY(_mutex);
 };
