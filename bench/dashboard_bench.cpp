@@ -14,9 +14,8 @@
 #include <thread>
 #include <vector>
 
-#include "backends/dashboard/dashboard_backend.h"
-#include "backends/dashboard/log_data_uploads.h"
 #include "fakes/world.h"
+#include "wire/constants.h"
 
 namespace {
 
@@ -53,13 +52,16 @@ int main() {
       getsockname(server, reinterpret_cast<sockaddr*>(&address), &length) != 0)
     return 1;
   World world;
-  backends::LogDataUploads uploads(world.http);
-  const Dictionary section{{"ip", "127.0.0.1"}, {"port", int{ntohs(address.sin_port)}}};
-  const auto backend =
-      backends::DashboardBackend::initWithName(world.services, uploads, "dashboard", &section, "Elm");
+  config::DashboardProfile section;
+  section.ip = "127.0.0.1";
+  section.port = ntohs(address.sin_port);
+  const auto backend = world.factory.newBackendWithName(
+      wire::kVeltraBackendDashboard, std::make_shared<const config::Profile>(section), "Elm", 7);
   if (!backend) return 1;
-  backend->setCompType(7);
-  backend->setUdid(std::string(40, 'a'));
+  backends::SessionFacts facts;
+  facts.compType = 7;
+  facts.device.udid = std::string(40, 'a');
+  backend->setFacts(std::make_shared<const backends::SessionFacts>(facts));
   Dictionary payload;
   for (int i = 0; i < 8; ++i) payload.set("key" + std::to_string(i), "a value of " + std::to_string(i));
   payload.set("seconds", 12.5);
@@ -67,7 +69,7 @@ int main() {
 
   const int bare = socket(AF_INET, SOCK_DGRAM, 0);
   if (connect(bare, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) return 1;
-  backend->backends::VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0);
+  backend->sendMessage(&payload, {1, 0}, 5, 10, 0);
   char first[2048];
   const auto bytes = static_cast<std::size_t>(recv(server, first, sizeof first, 0));
   std::thread drain([server] {
@@ -80,9 +82,7 @@ int main() {
   std::vector<double> floors, whole, ratios;
   for (int round = 0; round < kRounds; ++round) {
     floors.push_back(microsecondsOf([&] { (void)send(bare, same.data(), same.size(), MSG_DONTWAIT); }));
-    whole.push_back(microsecondsOf([&] {
-      backend->backends::VeltraBackend::sendMessage(&payload, {1, 0}, 5, 10, 0);
-    }));
+    whole.push_back(microsecondsOf([&] { backend->sendMessage(&payload, {1, 0}, 5, 10, 0); }));
     ratios.push_back(whole.back() / floors.back());
   }
   fmt::print("{{\"bareSendUs\": {:.2f}, \"messageUs\": {:.2f}, \"ratio\": {:.2f}, \"bytes\": {}}}\n",

@@ -4,6 +4,7 @@
 #include <openssl/evp.h>
 
 #include <cstdlib>
+#include <utility>
 
 #include "platform/random.h"
 
@@ -26,19 +27,6 @@ std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
   return hexadecimal;
 }
 
-void VeltraBackend::setSelfVersion(const std::string& version) {
-  const auto leadingInteger = [](const std::string& text) {
-    return static_cast<std::uint8_t>(std::strtoll(text.c_str(), nullptr, 10));
-  };
-  const std::size_t dot = version.find('.');
-  _selfVersionMajor = leadingInteger(version.substr(0, dot));
-  _selfVersionMinor = dot == std::string::npos ? std::uint8_t{0} : leadingInteger(version.substr(dot + 1));
-}
-
-void VeltraBackend::setStartTimestamp(platform::TimeValue timestamp) {
-  _startTimeStamp = platform::timevalToSeconds(timestamp);
-}
-
 void VeltraBackend::updateState() {
   setState(kBackendReporting);
 }
@@ -47,11 +35,10 @@ std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
                                                       platform::TimeValue timestamp, std::uint16_t method,
                                                       std::uint16_t respCode, std::int32_t flag) {
   ++_eventID;
-  return sendMessage(payload, timestamp, method, respCode, _eventID, flag);
+  return sendNumberedMessage({payload, timestamp, method, respCode, _eventID, flag});
 }
 
-std::optional<std::string> VeltraBackend::sendMessage(const Dictionary*, platform::TimeValue, std::uint16_t,
-                                                      std::uint16_t, std::uint16_t, std::int32_t) {
+std::optional<std::string> VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
   return std::nullopt;
 }
 
@@ -68,47 +55,37 @@ bool VeltraBackend::uploadLogData(const Array&) {
   return false;
 }
 
+std::shared_ptr<const SessionFacts> VeltraBackend::facts() const {
+  const Lock held(_mutex);
+  return _facts;
+}
+
+void VeltraBackend::setFacts(std::shared_ptr<const SessionFacts> facts) {
+  const Lock held(_mutex);
+  _facts.swap(facts);
+}
+
+void VeltraBackend::setUserInfoDict(SharedDictionary userInfo) {
+  const Lock held(_mutex);
+  auto changed = std::make_shared<SessionFacts>(*_facts);
+  changed->userInfo = std::move(userInfo);
+  _facts = std::move(changed);
+}
+
 void VeltraBackend::setCorrelatedSessionID(const std::string& sessionID) {
-  setCombinedSessionIDString(sessionID);
-}
-
-SharedDictionary VeltraBackend::userInfoDict() const {
-  const Lock held(_propertyMutex);
-  return _userInfoDict;
-}
-
-void VeltraBackend::setUserInfoDict(SharedDictionary value) {
-  const Lock held(_propertyMutex);
-  _userInfoDict = std::move(value);
-}
-
-std::optional<std::string> VeltraBackend::combinedSessionIDString() const {
-  const Lock held(_propertyMutex);
-  return _combinedSessionIDString;
-}
-
-void VeltraBackend::setCombinedSessionIDString(std::optional<std::string> value) {
-  const Lock held(_propertyMutex);
-  _combinedSessionIDString = std::move(value);
-}
-
-std::optional<std::string> VeltraBackend::displayURL() const {
-  const Lock held(_propertyMutex);
-  return _displayURL;
-}
-
-void VeltraBackend::setDisplayURL(std::optional<std::string> value) {
-  const Lock held(_propertyMutex);
-  _displayURL = std::move(value);
+  const Lock held(_mutex);
+  auto changed = std::make_shared<SessionFacts>(*_facts);
+  changed->combinedSessionIDString = sessionID;
+  _facts = std::move(changed);
 }
 
 std::optional<double> VeltraBackend::samplingThreshold() const {
-  const Lock held(_propertyMutex);
+  const Lock held(_mutex);
   return _samplingThreshold;
 }
 
 void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
-  const Lock held(_propertyMutex);
+  const Lock held(_mutex);
   _samplingThreshold = value;
 }
 

@@ -17,29 +17,36 @@ namespace {
 constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 }  // namespace
 
-std::shared_ptr<VeltraBackend> StandardBackendFactory::newBackendWithName(
+std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
+  const std::string family = productFamily.value_or("");
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName({_services, _logData, _dashboards, owner}, name,
-                                          std::get_if<config::DashboardProfile>(profile.get()),
-                                          productFamily.value_or(""));
+    return DashboardBackend::initWithName(
+        {_services.random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner},
+        name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
-    return UploadBackend::initWithName(_services, _files, name,
-                                       std::get_if<config::UploadProfile>(profile.get()),
-                                       productFamily.value_or(""));
+    return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
+                                        _services.counters, _services.scratchDirectory},
+                                       name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
-    return HTTPSPostBackend::initWithName(_services, _postErrors, name,
-                                          {profile, std::get_if<config::HTTPSPostProfile>(profile.get())},
-                                          productFamily);
+    return HTTPSPostBackend::initWithName(
+        {_services.random,
+         _services.locale,
+         _services.counters,
+         _posts,
+         {_services.preferences, _services.library, _services.settings}},
+        name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services, name, productFamily.value_or(""));
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
+                                       family);
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services, name, productFamily.value_or(""), clientType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
+                                     family, clientType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -8,7 +8,7 @@
 #include "backends/backend.h"
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/log_data_uploads.h"
-#include "backends/https/post_errors.h"
+#include "backends/https/event_posts.h"
 #include "backends/upload/file_uploads.h"
 #include "config/storebag_content.h"
 
@@ -26,6 +26,7 @@ class Counters;
 class LentFiles;
 class Locale;
 class Preferences;
+class Random;
 }  // namespace veltrad::platform
 
 namespace veltrad::support {
@@ -39,7 +40,8 @@ class CodeBundle;
 class EnergyLog;
 class WorkPool;
 
-// What the kinds of backends use; each takes its own few. Everything outlives the backends.
+// What the factory passes on: each kind of backend takes its own few. Everything outlives the backends. Its
+// 14 fields are what all kinds together use.
 struct BackendServices {
   http::HTTPClient& http;
   platform::Clock& clock;
@@ -60,38 +62,23 @@ struct BackendServices {
 // Null: its back end reads nothing of it.
 using SharedProfile = std::shared_ptr<const config::Profile>;
 
-// Who has a back end made.
-struct BackendOwner {
-  std::shared_ptr<platform::MemoryAccount> account = nullptr;  // null: nobody pays
-  bool oneShot = false;                                        // for one message, not for a session
-};
-
 class BackendFactory {
  public:
-  virtual ~BackendFactory() = default;
+  explicit BackendFactory(BackendServices services)
+      : _services(services),
+        _posts(services.http, services.clock, services.counters),
+        _logData(services.http, services.counters) {}
   // Null: no such backend here, or it cannot work with this profile; one line has said so. `profile` as the
   // section of a storebag has it under the name.
-  virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name,
-                                                            const SharedProfile& profile,
-                                                            const std::optional<std::string>& productFamily,
-                                                            std::int32_t clientType,
-                                                            const BackendOwner& owner = {}) = 0;
-};
-
-class StandardBackendFactory final : public BackendFactory {
- public:
-  explicit StandardBackendFactory(BackendServices services)
-      : _services(services), _logData(services.http, services.counters) {}
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    std::int32_t clientType,
-                                                    const BackendOwner& owner = {}) override;
+                                                    std::int32_t clientType, const BackendOwner& owner = {});
   // The lines that were held back: before the daemon ends.
-  void sayRest() { _postErrors.sayRest(); }
+  void sayRest() { _posts.sayRest(); }
 
  private:
   const BackendServices _services;
-  PostErrors _postErrors;
+  EventPosts _posts;
   LogDataUploads _logData;
   const std::shared_ptr<DashboardQueues> _dashboards = std::make_shared<DashboardQueues>();
   FileUploads _files;

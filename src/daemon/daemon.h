@@ -22,7 +22,7 @@ class Daemon {
  public:
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
-  backends::StandardBackendFactory& backends() { return _factory; }
+  backends::BackendFactory& backends() { return _factory; }
 
  private:
   support::Veltra _library;
@@ -30,7 +30,7 @@ class Daemon {
   config::ProcessSettings _settings;
   support::MessageLogFile _messageLog;
   session::FlushCounters _flushes;
-  backends::StandardBackendFactory _factory;
+  backends::BackendFactory _factory;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
 };

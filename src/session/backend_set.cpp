@@ -1,6 +1,8 @@
 // Backends made and told what they need to know.
 #include "session/backend_set.h"
 
+#include <utility>
+
 #include "backends/backend_factory.h"
 #include "config/storebag_content.h"
 #include "platform/clock.h"
@@ -14,8 +16,7 @@ namespace veltrad::session {
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo,
-                                                 const backends::SharedDictionary& userInfo,
-                                                 const std::string& deviceID) {
+                                                 backends::SessionFacts facts) {
   if (!storebag) {
     logError("createBackends: Attempted to create backends with nil storebag");
     return nullptr;
@@ -24,35 +25,27 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
     logError("createBackends: Attempted to create backends with nil session info");
     return nullptr;
   }
-  const platform::TimeValue start = making.clock.now();
-  const auto productVersion = making.device.deviceProductVersion();
-  const auto buildVersion = making.device.deviceBuildVersion();
-  const auto hardwareType = making.device.deviceProductType();
+  facts.startTimeStamp = platform::timevalToSeconds(making.clock.now());
+  facts.device.productVersion = making.device.deviceProductVersion();
+  facts.device.buildVersion = making.device.deviceBuildVersion();
+  facts.device.hardwareType = making.device.deviceProductType();
   const auto productFamily = making.device.deviceName();
-  const bool isInternal = making.device.isInternalBuild();
-  const std::string selfVersion = making.library.packageVersion();
+  facts.device.isInternal = making.device.isInternalBuild();
+  facts.selfVersion = backends::SelfVersion::of(making.library.packageVersion());
+  facts.sessionID = sessionInfo->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
+  facts.compType = sessionInfo->int32(wire::kVeltraSessionInfoClientType).value_or(0);
+  facts.clientVersion = sessionInfo->uint16(wire::kVeltraSessionInfoClientVersion).value_or(0);
+  facts.requireUserInfo = sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
+  facts.batchEvents = sessionInfo->boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false);
+  facts.account = making.account;
 
-  const std::int32_t clientType = sessionInfo->int32(wire::kVeltraSessionInfoClientType).value_or(0);
+  const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   const auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : storebag->backends) {
-    const auto backend = making.factory.newBackendWithName(name, profile, productFamily, clientType,
+    const auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared->compType,
                                                            {making.account, making.oneShot});
     if (!backend) continue;
-    backend->setSessionID(sessionInfo->uint32(wire::kVeltraSessionInfoSessionID).value_or(0));
-    backend->setCompType(clientType);
-    backend->setClientVersion(sessionInfo->uint16(wire::kVeltraSessionInfoClientVersion).value_or(0));
-    backend->setUdid(deviceID);
-    backend->setProductVersion(productVersion);
-    backend->setBuildVersion(buildVersion);
-    backend->setHardwareType(hardwareType);
-    backend->setIsInternal(isInternal);
-    backend->setRequireUserInfo(
-        sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false));
-    backend->setBatchEvents(sessionInfo->boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false));
-    backend->setUserInfoDict(userInfo);
-    backend->setSelfVersion(selfVersion);
-    backend->setStartTimestamp(start);
-    backend->setMemoryAccount(making.account);
+    backend->setFacts(shared);
     made->emplace(name, backend);
   }
   return made;

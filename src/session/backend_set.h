@@ -44,12 +44,11 @@ struct BackendMaking {
 };
 
 // One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,
-// with one error line, without a storebag or without session info. `deviceID` may be empty.
+// with one error line, without a storebag or without session info. `facts` has the user info, the device's
+// identifier and the session's ID, where it has one; the rest is found out here.
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
-                                                 const Dictionary* sessionInfo,
-                                                 const backends::SharedDictionary& userInfo,
-                                                 const std::string& deviceID);
+                                                 const Dictionary* sessionInfo, backends::SessionFacts facts);
 
 // The names of those in state 2 or 3.
 std::vector<std::string> reportingNames(const BackendSet& backends);

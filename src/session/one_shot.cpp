@@ -21,7 +21,10 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   }
   char deviceID[41] = {};
   making.device.copyUniqueDeviceID(deviceID, sizeof deviceID);
-  const auto set = createBackends(making, message.storebag, message.sessionInfo, message.userInfo, deviceID);
+  backends::SessionFacts facts;
+  facts.device.udid = deviceID;
+  facts.userInfo = message.userInfo;
+  const auto set = createBackends(making, message.storebag, message.sessionInfo, std::move(facts));
   if (!set) {
     logError("sendMessageWithSessionInfo: No backends available to send single message");
     return;

@@ -118,12 +118,13 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   logDebug("createBackendsWithStorebag: Creating backends for session %u", _sessionID);
   // It may have been out of reach when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
+  backends::SessionFacts facts;
+  facts.device.udid = _deviceid;
+  facts.userInfo = _userInfo;
+  facts.combinedSessionIDString = _sessionIDString;
   auto made =
       createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
-                     &storebag, _sessionInfo.get(), _userInfo, _deviceid);
-  if (made) {
-    for (const auto& [name, backend] : *made) backend->setCombinedSessionIDString(_sessionIDString);
-  }
+                     &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   // A second start: what it replaced is let go in order.
   if (made) {

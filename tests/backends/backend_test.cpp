@@ -1,22 +1,23 @@
-// What every back end has: event numbers, versions, digests.
+// What every back end has: event numbers, versions, digests, facts.
 #include "backends/backend.h"
 
 #include <gtest/gtest.h>
+
+#include <thread>
 
 #include "fakes/machine.h"
 
 namespace veltrad {
 namespace {
 
+struct Counting final : backends::VeltraBackend {
+  explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
+  std::optional<std::string> sendNumberedMessage(const backends::NumberedMessage& message) override {
+    return std::to_string(message.eventID);
+  }
+};
+
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
-  struct Counting final : backends::VeltraBackend {
-    explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
-    using backends::VeltraBackend::sendMessage;
-    std::optional<std::string> sendMessage(const Dictionary*, platform::TimeValue, std::uint16_t,
-                                           std::uint16_t, std::uint16_t eventID, std::int32_t) override {
-      return std::to_string(eventID);
-    }
-  };
   FakeRandom random;
   const auto backend = std::make_shared<Counting>(random);
   EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "1");
@@ -25,11 +26,31 @@ TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "1");
   for (const auto& [text, major, minor] :
        {std::tuple{"9.3", 9, 3}, {"10", 10, 0}, {"300.1", 44, 1}, {"x.y", 0, 0}, {"8.0.7", 8, 0}}) {
-    backend->setSelfVersion(text);
-    EXPECT_EQ(backend->selfVersionMajor(), major) << text;
-    EXPECT_EQ(backend->selfVersionMinor(), minor) << text;
+    const auto version = backends::SelfVersion::of(text);
+    EXPECT_EQ(version.major, major) << text;
+    EXPECT_EQ(version.minor, minor) << text;
   }
   EXPECT_EQ(backends::VeltraBackend::convertIntoSHA256("").substr(0, 8), "e3b0c442");
+}
+
+// User info comes from the session's own thread, the combined session ID from any: neither undoes the other.
+TEST(VeltraBackend, ItsFactsChangeAsAWholeAndOnlyWhereTheyAreToldTo) {
+  FakeRandom random;
+  Counting backend(random);
+  auto facts = std::make_shared<backends::SessionFacts>();
+  facts->sessionID = 7;
+  backend.setFacts(facts);
+  std::thread other([&] {
+    for (int i = 0; i <= 1000; ++i) backend.setCorrelatedSessionID("ancestor." + std::to_string(i));
+  });
+  for (int i = 0; i <= 1000; ++i)
+    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}));
+  other.join();
+  const auto now = backend.facts();
+  EXPECT_EQ(now->sessionID, 7u);
+  EXPECT_EQ(now->combinedSessionIDString, "ancestor.1000");
+  EXPECT_EQ(now->userInfo->int32("number"), 1000);
+  EXPECT_TRUE(!facts->userInfo && !facts->combinedSessionIDString);  // shared with other back ends
 }
 
 }  // namespace

@@ -68,11 +68,13 @@ class Dashboard : public ::testing::Test {
     return std::distance(begin(all), end(all));
   }
   std::shared_ptr<backends::VeltraBackend> configured(std::shared_ptr<backends::VeltraBackend> backend) {
-    backend->setCompType(7);
-    backend->setSessionID(4660);
-    backend->setClientVersion(3);
-    backend->setUdid(kDevice);
-    backend->setSelfVersion("2.0");
+    backends::SessionFacts facts;
+    facts.compType = 7;
+    facts.sessionID = 4660;
+    facts.clientVersion = 3;
+    facts.device.udid = kDevice;
+    facts.selfVersion = {2, 0};
+    backend->setFacts(std::make_shared<const backends::SessionFacts>(facts));
     return backend;
   }
   RecordedLog log;
@@ -82,15 +84,20 @@ class Dashboard : public ::testing::Test {
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
   backends::LogDataUploads uploads(world.http, world.counters);
-  const backends::DashboardMaking making{
-      world.services, uploads, std::make_shared<backends::DashboardQueues>(), {}};
+  const backends::DashboardMaking making{world.random,
+                                         world.clock,
+                                         world.counters,
+                                         world.pool,
+                                         uploads,
+                                         std::make_shared<backends::DashboardQueues>(),
+                                         {}};
   const auto direct =
       backends::DashboardBackend::initWithName(making, "direct", "127.0.0.1"s, server.port, "Desktop");
   const std::pair<std::shared_ptr<backends::VeltraBackend>, char> cases[] = {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
   for (const auto& [backend, flags] : cases) {
-    const auto line = backend->sendMessage(&payload, kTime, 1, 0, 5, 0);
+    const auto line = backend->sendNumberedMessage({&payload, kTime, 1, 0, 5, 0});
     EXPECT_EQ(server.receive(), "\x02\x07\x01\x1E\x53\x72\x4E\x00\xFF\xFF\xED\xCB\xFF\xFC\xFF\xA6\0\1\0\0"s +
                                     kDevice + "\0\5\0"s + flags + " codec=opus with 18 chars");
     EXPECT_EQ(line, "1400000000.120 " + kDevice +

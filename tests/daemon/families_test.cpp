@@ -70,7 +70,9 @@ struct Session {
       backend = std::make_shared<Reporting>(wire::kVeltraBackendDashboard, random);
       backend->setState(state);
       backend->setSamplingThreshold(id[0]);
-      backend->setCombinedSessionIDString(id);
+      backends::SessionFacts facts;
+      facts.combinedSessionIDString = id;
+      backend->setFacts(std::make_shared<const backends::SessionFacts>(std::move(facts)));
       set->emplace(wire::kVeltraBackendDashboard, backend);
     }
     identify(name);
@@ -87,7 +89,7 @@ struct Session {
   std::string look() const {
     std::string text = id;
     if (backend) {
-      text = *backend->combinedSessionIDString() + "=" + std::to_string(backend->state()) +
+      text = *backend->facts()->combinedSessionIDString + "=" + std::to_string(backend->state()) +
              static_cast<char>(*backend->samplingThreshold());
     }
     return text + (aggregation->active() ? "!" : "");

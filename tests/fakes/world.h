@@ -38,7 +38,7 @@ struct World {
   const backends::BackendServices services{http,     clock,     random,        locale,   preferences,
                                            counters, energyLog, adaptorBundle, settings, device,
                                            library,  pool,      lentFiles};
-  backends::StandardBackendFactory factory{services};
+  backends::BackendFactory factory{services};
 };
 
 }  // namespace veltrad

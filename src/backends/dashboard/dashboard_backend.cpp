@@ -80,16 +80,15 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): socket connect() failed.");
     return nullptr;
   }
-  WorkPool& pool = making.services.pool;
+  WorkPool& pool = making.pool;
   auto timer = PoolTimer::make(pool);
   if (!timer) {
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
   const NetworkProcQueue::Kind kind{reliable, making.owner.oneShot, server.period};
-  const auto queue =
-      std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.owner.account,
-                                         making.queues, making.services.counters);
+  const auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind,
+                                                        making.owner.account, making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
     logError("DashboardBackend(useReliableUDP): can't create read source");
   }
@@ -136,10 +135,10 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
 
 DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::string& name,
                                    const config::DashboardProfile* profile, const std::string& productFamily)
-    : VeltraBackend(name, productFamily, making.services.random),
+    : VeltraBackend(name, productFamily, making.random),
       _uploads(making.uploads),
-      _clock(making.services.clock),
-      _counters(making.services.counters),
+      _clock(making.clock),
+      _counters(making.counters),
       _usingProfile(profile != nullptr),
       _postURL(profile ? profile->postURL : std::nullopt) {}
 
@@ -147,37 +146,36 @@ DashboardBackend::~DashboardBackend() {
   cleanup();
 }
 
-std::optional<std::string> DashboardBackend::sendMessage(const Dictionary* payload,
-                                                         platform::TimeValue timestamp, std::uint16_t method,
-                                                         std::uint16_t respCode, std::uint16_t eventID,
-                                                         std::int32_t) {
+std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
   tagReportingPacket packet;
-  packet.header = headerOf(timestamp, method, respCode, eventID);
+  packet.header = headerOf(message);
   PacketText text(packet.text);
-  if (payload) text.append(*payload);
+  if (message.payload) text.append(*message.payload);
   if (text.cut()) _counters.count(wire::Reason::datagram_cut);
   const std::size_t length = sizeof packet.header + text.length();
   packet.header.invertedLength = htobe16(static_cast<std::uint16_t>(~length));
 
   std::string line = writeLocalLog(packet);
-  _networkProcQueue->tryToSendMsg({reinterpret_cast<const char*>(&packet), length}, eventID);
+  _networkProcQueue->tryToSendMsg({reinterpret_cast<const char*>(&packet), length}, message.eventID);
   return line;
 }
 
-tagReportingPacketHeader DashboardBackend::headerOf(platform::TimeValue timestamp, std::uint16_t method,
-                                                    std::uint16_t respCode, std::uint16_t eventID) const {
+tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
+  const auto facts = this->facts();
+  const std::string& udid = facts->device.udid;
+  const platform::TimeValue time = message.timestamp;
   tagReportingPacketHeader header{};
-  header.versionMajor = selfVersionMajor();
-  header.componentType = static_cast<std::uint8_t>(compType());
+  header.versionMajor = facts->selfVersion.major;
+  header.componentType = static_cast<std::uint8_t>(facts->compType);
   header.kind = kPacketKind;
-  header.timeFraction = static_cast<std::uint8_t>(timestamp.microseconds / kMicrosecondsPerFraction);
-  header.seconds = htobe32(static_cast<std::uint32_t>(timestamp.seconds));
-  header.invertedSessionID = htobe32(~sessionID());
-  header.invertedClientVersion = htobe16(static_cast<std::uint16_t>(~clientVersion()));
-  header.method = htobe16(method);
-  header.respCode = htobe16(respCode);
-  std::memcpy(header.deviceID, udid().data(), std::min(udid().size(), sizeof header.deviceID));
-  header.eventID = htobe16(eventID);
+  header.timeFraction = static_cast<std::uint8_t>(time.microseconds / kMicrosecondsPerFraction);
+  header.seconds = htobe32(static_cast<std::uint32_t>(time.seconds));
+  header.invertedSessionID = htobe32(~facts->sessionID);
+  header.invertedClientVersion = htobe16(static_cast<std::uint16_t>(~facts->clientVersion));
+  header.method = htobe16(message.method);
+  header.respCode = htobe16(message.respCode);
+  std::memcpy(header.deviceID, udid.data(), std::min(udid.size(), sizeof header.deviceID));
+  header.eventID = htobe16(message.eventID);
   header.flags =
       htobe16(static_cast<std::uint16_t>((_networkProcQueue->reliableUDP() ? kPacketFlagReliable : 0) |
                                          (_usingProfile ? 0 : kPacketFlagNoProfile)));

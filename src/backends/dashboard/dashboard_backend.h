@@ -8,18 +8,22 @@
 #include <string>
 
 #include "backends/backend.h"
-#include "backends/backend_factory.h"
 #include "backends/dashboard/network_proc_queue.h"
 #include "backends/dashboard/reporting_packet.h"
+#include "config/storebag_content.h"
 
 namespace veltrad::backends {
 
 class DashboardQueues;
 class LogDataUploads;
+class WorkPool;
 
-// What a dashboard back end is made from. The services and the uploads outlive it.
+// What a dashboard back end is made from. What it refers to outlives it.
 struct DashboardMaking {
-  const BackendServices& services;
+  platform::Random& random;
+  platform::Clock& clock;
+  platform::Counters& counters;
+  WorkPool& pool;
   LogDataUploads& uploads;
   std::shared_ptr<DashboardQueues> queues;
   BackendOwner owner;
@@ -47,11 +51,8 @@ class DashboardBackend final : public VeltraBackend {
       const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
-  using VeltraBackend::sendMessage;
   // The dashboard text line of the message.
-  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
+  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
 
@@ -59,8 +60,7 @@ class DashboardBackend final : public VeltraBackend {
   DashboardBackend(const DashboardMaking& making, const std::string& name,
                    const config::DashboardProfile* profile, const std::string& productFamily);
 
-  tagReportingPacketHeader headerOf(platform::TimeValue timestamp, std::uint16_t method,
-                                    std::uint16_t respCode, std::uint16_t eventID) const;
+  tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
 
   // Constant after initialisation.
   LogDataUploads& _uploads;

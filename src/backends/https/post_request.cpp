@@ -3,7 +3,6 @@
 
 #include <fmt/format.h>
 
-#include "backends/backend.h"
 #include "backends/https/event.h"
 #include "support/gzip.h"
 #include "wire/constants.h"
@@ -16,7 +15,7 @@ std::string orNull(const std::optional<std::string>& text) {
 }
 }  // namespace
 
-http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
+http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
                                   std::optional<EventMap> eventMap) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
@@ -29,7 +28,7 @@ http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url,
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
 
   auto& headers = request.headers;
-  if (const SharedDictionary userInfo = backend.userInfoDict()) {
+  if (const SharedDictionary& userInfo = facts.userInfo) {
     if (const std::string* name = userInfo->string(wire::kVeltraUserInfoClientName)) {
       headers.emplace_back("X-VLT-Client-Name", *name);
     }
@@ -37,12 +36,12 @@ http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url,
       headers.emplace_back("X-VLT-Service-Name", *name);
     }
   }
-  if (backend.isInternal()) headers.emplace_back("X-VLT-Internal-Build", "1");
-  headers.emplace_back("User-Agent", fmt::format("Veltra/{}.{} ({}; {})", backend.selfVersionMajor(),
-                                                 backend.selfVersionMinor(), orNull(backend.hardwareType()),
-                                                 orNull(backend.productVersion())));
-  headers.emplace_back("X-VLT-Client-Version", fmt::format("{}", backend.clientVersion()));
-  headers.emplace_back("X-VLT-Sender", senderCode(backend.compType()));
+  if (facts.device.isInternal) headers.emplace_back("X-VLT-Internal-Build", "1");
+  headers.emplace_back("User-Agent",
+                       fmt::format("Veltra/{}.{} ({}; {})", facts.selfVersion.major, facts.selfVersion.minor,
+                                   orNull(facts.device.hardwareType), orNull(facts.device.productVersion)));
+  headers.emplace_back("X-VLT-Client-Version", fmt::format("{}", facts.clientVersion));
+  headers.emplace_back("X-VLT-Sender", senderCode(facts.compType));
   if (eventMap) {
     headers.emplace_back("X-VLT-Event-Map", fmt::format("{} {}", eventMap->method, eventMap->responseCode));
   }

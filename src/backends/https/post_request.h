@@ -10,7 +10,7 @@
 
 namespace veltrad::backends {
 
-class VeltraBackend;
+struct SessionFacts;
 
 // What a single event's post says of it in "X-VLT-Event-Map"; a flush has none.
 struct EventMap {
@@ -20,7 +20,7 @@ struct EventMap {
 
 // A POST of the JSON bytes, compressed when that is strictly shorter, with the headers that name the client,
 // the sender and the daemon. A text that is absent in "User-Agent" is "(null)".
-http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url, std::string json,
+http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
                                   std::optional<EventMap> eventMap);
 
 // What an answer's status means for the backend and for the events of the post.

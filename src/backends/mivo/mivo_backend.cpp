@@ -15,11 +15,11 @@ bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
   return clientType >= 0 && clientType <= kHighestClientType && (kAllowedClientTypes >> clientType & 1) != 0;
 }
 
-std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& services,
-                                                       const std::string& name,
+std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platform::Counters& counters,
+                                                       platform::Random& random, const std::string& name,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, productFamily));
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(bundle, counters, random, name, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -29,34 +29,30 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& se
   return backend;
 }
 
-MivoBackend::MivoBackend(const BackendServices& services, const std::string& name,
-                         const std::string& productFamily)
-    : VeltraBackend(name, productFamily, services.random),
-      _counters(services.counters),
-      _clientBundle(services.adaptorBundle) {}
+MivoBackend::MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
+                         const std::string& name, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, random), _counters(counters), _clientBundle(bundle) {}
 
 void MivoBackend::loadAdaptor() {
   std::string failure;
   const auto found = adaptorClassNamed(_clientBundle, VELTRA_ADAPTOR_CLASS);
   if (found.ok()) {
-    _mivoAdaptorClass = found.value();
-    _mivoAdaptor = Adaptor::make(*_mivoAdaptorClass, failure);
+    _mivoAdaptor = Adaptor::make(*found.value(), failure);
   } else {
     failure = found.error();
   }
   if (!_mivoAdaptor) logWarning("MivoBackend(initWithName): no Mivo adaptor: %s", failure.c_str());
 }
 
-std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, platform::TimeValue,
-                                                    std::uint16_t method, std::uint16_t respCode,
-                                                    std::uint16_t, std::int32_t) {
+std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
     _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
     return std::nullopt;
   }
-  const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, method, respCode, payload);
+  const auto thrown =
+      _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode, message.payload);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());

@@ -8,7 +8,6 @@
 #include <string>
 
 #include "backends/backend.h"
-#include "backends/backend_factory.h"
 #include "backends/mivo/adaptor.h"
 
 namespace veltrad::backends {
@@ -18,25 +17,23 @@ namespace veltrad::backends {
 class MivoBackend final : public VeltraBackend {
  public:
   // Null for a client type that has no adaptor; one error line has said so.
-  static std::shared_ptr<MivoBackend> initWithName(const BackendServices& services, const std::string& name,
+  static std::shared_ptr<MivoBackend> initWithName(CodeBundle& bundle, platform::Counters& counters,
+                                                   platform::Random& random, const std::string& name,
                                                    const std::string& productFamily, std::int32_t clientType);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
 
-  using VeltraBackend::sendMessage;
   // Nothing, always. Payload, method and response code are handed on as they are.
-  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::uint16_t eventID,
-                                         std::int32_t flag) override;
+  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
 
  private:
-  MivoBackend(const BackendServices& services, const std::string& name, const std::string& productFamily);
+  MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
+              const std::string& name, const std::string& productFamily);
   void loadAdaptor();
 
   // Constant after initialisation.
   platform::Counters& _counters;
   CodeBundle& _clientBundle;
-  const veltra_adaptor_class* _mivoAdaptorClass = nullptr;
   std::unique_ptr<Adaptor> _mivoAdaptor;  // null: none could be had
 };
 

@@ -13,6 +13,7 @@
 #include "platform/counters.h"
 #include "platform/lent_files.h"
 #include "platform/log.h"
+#include "platform/memory_budget.h"
 #include "support/gzip.h"
 
 namespace veltrad::backends {
@@ -48,51 +49,50 @@ void sayUnreadable(const std::string& path, int error) {
 
 }  // namespace
 
-std::shared_ptr<UploadBackend> UploadBackend::initWithName(const BackendServices& services,
-                                                           FileUploads& uploads, const std::string& name,
+std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& making,
+                                                           const std::string& name,
                                                            const config::UploadProfile* profile,
                                                            const std::string& productFamily) {
   if (!profile || !profile->postURL) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  std::shared_ptr<UploadBackend> backend(new UploadBackend(services, uploads, name, productFamily));
-  backend->setUploadURL(profile->postURL);
+  std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile->postURL, productFamily));
   backend->setDisplayURL(profile->displayURL);
   return backend;
 }
 
-UploadBackend::UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
-                             const std::string& productFamily)
-    : VeltraBackend(name, productFamily, services.random),
-      _uploads(uploads),
-      _http(services.http),
-      _counters(services.counters),
-      _lentFiles(services.lentFiles),
-      _scratchDirectory(services.scratchDirectory) {}
+UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name,
+                             const std::string& uploadURL, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.random),
+      _uploads(making.uploads),
+      _http(making.http),
+      _lentFiles(making.lentFiles),
+      _counters(making.counters),
+      _scratchDirectory(making.scratchDirectory),
+      _uploadURL(uploadURL) {}
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
-  const auto url = uploadURL();
-  if (!url) return false;
   const auto lent = _lentFiles.consume(extensionToken);
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
-  const auto place = _uploads.enter(userOf(memoryAccount()), _http);
+  const auto facts = this->facts();
+  const auto place = _uploads.enter(userOf(facts->account), _http);
   if (!place) {
     sayStopping();
     return false;
   }
   CompressedFile gzipped(_scratchDirectory);
   if (!compress(*file, path, gzipped)) return false;
-  auto request = uploadRequest(*url, {udid(), sessionID()}, path);
+  auto request = uploadRequest(_uploadURL, facts->device.udid, facts->sessionID, path);
   if (!request) {
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
     _counters.count(wire::Reason::file_bad_address);
     return false;
   }
   gzipped.become(*request);
-  if (confirms(*url, _http.perform(std::move(*request)))) remove(*lent, *file, path);
+  if (confirms(_http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
 }
 
@@ -168,7 +168,7 @@ void UploadBackend::sayStopping() const {
 }
 
 // Says and counts how the exchange ended, too.
-bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& answer) const {
+bool UploadBackend::confirms(const http::HTTPResult& answer) const {
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",
              answer.ok() ? "(null)" : answer.error().description.c_str());
@@ -177,7 +177,7 @@ bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& ans
   }
   const std::string& body = answer.value().body;
   const bool text = isUTF8(body);
-  logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", url.c_str(),
+  logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", _uploadURL.c_str(),
            text ? body.c_str() : "(undecodable)");
   const bool confirmed = text && body.find(kConfirmation) != std::string::npos;
   _counters.count(confirmed ? wire::Reason::file_uploaded : wire::Reason::file_not_confirmed);
@@ -194,16 +194,6 @@ void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& f
   }
   _counters.count(lent.askForRemoval() ? wire::Reason::file_removal_asked
                                        : wire::Reason::file_removal_not_asked);
-}
-
-std::optional<std::string> UploadBackend::uploadURL() const {
-  const Lock held(_urlMutex);
-  return _uploadURL;
-}
-
-void UploadBackend::setUploadURL(std::optional<std::string> value) {
-  const Lock held(_urlMutex);
-  _uploadURL = std::move(value);
 }
 
 }  // namespace veltrad::backends

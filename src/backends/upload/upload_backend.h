@@ -7,8 +7,8 @@
 #include <string>
 
 #include "backends/backend.h"
-#include "backends/backend_factory.h"
 #include "backends/upload/file_snapshot.h"
+#include "config/storebag_content.h"
 #include "http/http_client.h"
 
 namespace veltrad::platform {
@@ -21,14 +21,23 @@ namespace veltrad::backends {
 class CompressedFile;
 class FileUploads;
 
+// What an upload back end is made from. Everything outlives it.
+struct UploadMaking {
+  platform::Random& random;
+  FileUploads& uploads;
+  http::HTTPClient& http;
+  platform::LentFiles& lentFiles;
+  platform::Counters& counters;
+  std::string scratchDirectory;  // for files without a name
+};
+
 // Keeps nothing between uploads but its address. Sees a file through the descriptor that its client lent,
 // never by a path. Takes no part in message reporting.
 class UploadBackend final : public VeltraBackend {
  public:
   // From a storebag's section: "post_url" (without a query), and where given "display_url". Null, after one
   // error line, without the first.
-  static std::shared_ptr<UploadBackend> initWithName(const BackendServices& services, FileUploads& uploads,
-                                                     const std::string& name,
+  static std::shared_ptr<UploadBackend> initWithName(const UploadMaking& making, const std::string& name,
                                                      const config::UploadProfile* profile,
                                                      const std::string& productFamily);
 
@@ -36,30 +45,24 @@ class UploadBackend final : public VeltraBackend {
   // is asked to remove its file. Error lines say why it was not.
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
 
-  // Any thread.
-  std::optional<std::string> uploadURL() const;
-  void setUploadURL(std::optional<std::string> value);
-
  private:
-  UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
+  UploadBackend(const UploadMaking& making, const std::string& name, const std::string& uploadURL,
                 const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
   bool compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const;
-  bool confirms(const std::string& url, const http::HTTPResult& answer) const;
+  bool confirms(const http::HTTPResult& answer) const;
   void sayStopping() const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
   // Constant after construction.
   FileUploads& _uploads;
   http::HTTPClient& _http;
-  platform::Counters& _counters;
   platform::LentFiles& _lentFiles;
+  platform::Counters& _counters;
   const std::string _scratchDirectory;
-
-  mutable Mutex _urlMutex BACKEND_LOCK;
-  std::optional<std::string> _uploadURL GUARDED_BY(_urlMutex);
+  const std::string _uploadURL;
 };
 
 }  // namespace veltrad::backends

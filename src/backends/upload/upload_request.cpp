@@ -31,14 +31,13 @@ std::string_view lastPathComponent(std::string_view path) {
   return path.substr(path.rfind('/') + 1);
 }
 
-std::optional<http::HTTPRequest> uploadRequest(const std::string& uploadURL, const UploadIdentity& who,
-                                               std::string_view path) {
+std::optional<http::HTTPRequest> uploadRequest(const std::string& uploadURL, const std::string& udid,
+                                               std::uint32_t sessionID, std::string_view path) {
   const std::string name = std::string(lastPathComponent(path)) + ".gz";
   http::HTTPRequest request;
-  request.url =
-      fmt::sprintf("%s?uuid=%s&sequence=%u&description=%s%%20(Uploaded%%20by%%20PKV)&filename=%s&raw=true",
-                   uploadURL, who.udid, who.sessionID, percentEncoded(kDescription, kKeptInQuery),
-                   percentEncoded(name, kKeptInQuery));
+  request.url = fmt::sprintf(
+      "%s?uuid=%s&sequence=%u&description=%s%%20(Uploaded%%20by%%20PKV)&filename=%s&raw=true", uploadURL,
+      udid, sessionID, percentEncoded(kDescription, kKeptInQuery), percentEncoded(name, kKeptInQuery));
   if (uploadURL.empty() || !mayBeURL(request.url)) return std::nullopt;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::upload;

@@ -1,0 +1,100 @@
+// Events posted, and what becomes of them.
+#include "backends/https/event_posts.h"
+
+#include <fmt/printf.h>
+
+#include <cstdint>
+#include <utility>
+
+#include "platform/counters.h"
+#include "platform/log.h"
+
+namespace veltrad::backends {
+
+namespace {
+wire::Reason reasonOf(http::HTTPError::Kind kind) {
+  switch (kind) {
+    case http::HTTPError::Kind::transport:
+    case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
+      return wire::Reason::post_failed;
+    case http::HTTPError::Kind::tooMany:
+      return wire::Reason::too_many_posts;
+    case http::HTTPError::Kind::shortage:
+      return wire::Reason::post_shortage;
+    case http::HTTPError::Kind::stopping:
+      return wire::Reason::post_stopped;
+  }
+  return wire::Reason::post_failed;
+}
+
+void logPostError(const std::optional<std::string>& text) {
+  if (text) logError("HTTPSPostBackend(postJsonMessage): post error: %s", text->c_str());
+}
+}  // namespace
+
+void EventPosts::sayRest() {
+  logPostError(_errorLine.rest());
+}
+
+void EventPosts::restrict(Dictionary& event) const {
+  _counters.count(wire::Reason::field_not_json, restrictEventForJSON(event));
+}
+
+JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> events,
+                                                       const std::string& clientID, bool wantPretty) const {
+  const double postTime = platform::timevalToSeconds(_clock.now());
+  for (Dictionary& event : events) restrict(event);
+  return makeJSONMessage(postTime, clientID, std::move(events), wantPretty);
+}
+
+void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
+                                 const std::optional<std::string>& url, Post post) {
+  if (!url) {
+    _counters.count(wire::Reason::post_url_nil, post.eventCount);
+    if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
+    return;
+  }
+  http::HTTPRequest request = makePostRequest(facts, *url, std::move(post.json), post.eventMap);
+  request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
+  request.charge = std::move(post.charge);
+  if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
+    return refusePost(*backEnd, post.eventCount, post.completion);
+  }
+  const auto answered = [this, backEnd, postedTo = *url, eventCount = post.eventCount,
+                         completion = std::move(post.completion)](const http::HTTPResult& result) {
+    auto error = handleAnswer(*backEnd, result, postedTo, eventCount);
+    if (completion) completion(std::nullopt, std::move(error));
+  };
+  if (auto refusal = _http.start(std::move(request), answered)) answered(Failure{std::move(*refusal)});
+}
+
+void EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
+                            const VeltraBackend::FlushCompletion& completion) {
+  const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
+  auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount);
+  if (completion) completion(std::nullopt, std::move(error));
+}
+
+std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& backEnd,
+                                                             const http::HTTPResult& result,
+                                                             const std::string& url, std::size_t eventCount) {
+  std::optional<wire::ReportingError> error;
+  if (!result.ok()) {
+    const std::string& description = result.error().description;
+    logPostError(_errorLine.happened(description));
+    logDebug("HTTPSPostBackend(postJsonMessage): posted to %s", url.c_str());
+    error = wire::makeReportingError(description, -1);
+  }
+  const int status = result.ok() ? result.value().status : result.error().status;
+  const PostVerdict verdict = verdictOfStatus(status);
+  const bool answered = result.ok() || verdict.disablesBackend;
+  _counters.count(answered ? verdict.reason : reasonOf(result.error().kind), eventCount);
+  if (!verdict.disablesBackend) return error;
+  const std::string text =
+      fmt::sprintf("backend %s disabled by server %d return code", backEnd.name(), status);
+  logInfo("postJSONMessage: %s", text.c_str());
+  backEnd.setState(kBackendDisabled);
+  return wire::makeReportingError(text, status);
+}
+
+}  // namespace veltrad::backends

@@ -1,0 +1,72 @@
+// Whether and how an HTTPS post back end reports for its current client. The session's thread.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "backends/backend.h"
+#include "backends/https/client_decision.h"
+#include "backends/https/filter_table.h"
+#include "backends/https/post_identity.h"
+#include "backends/https/post_links.h"
+#include "config/storebag_content.h"
+
+namespace veltrad::platform {
+class Locale;
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
+
+// Part of its back end, which it reads the facts from, and tells hierarchy and sampling
+// threshold. What a run does not reach stays as an earlier one has left it.
+class HTTPSPostState {
+ public:
+  // `profile` has "clients".
+  HTTPSPostState(VeltraBackend& backEnd, std::shared_ptr<const config::HTTPSPostProfile> profile,
+                 platform::Locale& locale, platform::Counters& counters,
+                 const PostIdentity::Sources& identity)
+      : _backEnd(backEnd),
+        _profile(std::move(profile)),
+        _locale(locale),
+        _counters(counters),
+        _identity(identity),
+        _links(identity.preferences) {}
+
+  // The state (BackendState) for the present user info.
+  std::int32_t updateBackendState();
+
+  bool batchEvents(const SessionFacts& facts) const { return _batchEvents.value_or(facts.batchEvents); }
+  const PostIdentity& identity() const { return _identity; }
+  const PostLinks& links() const { return _links; }
+  const FilterTable& filters() const { return _filters; }
+  std::int32_t eventThreshold() const { return _eventThreshold; }
+  const std::optional<double>& overrideSampling() const { return _overrideSampling; }
+
+ private:
+  void applyExpedite(const config::ClientEntry& entry);
+  std::int32_t reportForEveryone();
+  std::int32_t reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
+                               const std::optional<std::string>& serviceName);
+  void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
+                  const std::optional<std::string>& country) const;
+  void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
+  void resetBackendStateWithClient(const config::ClientEntry* entry);
+
+  // Constant after construction.
+  VeltraBackend& _backEnd;
+  const std::shared_ptr<const config::HTTPSPostProfile> _profile;
+  platform::Locale& _locale;
+  platform::Counters& _counters;
+
+  PostIdentity _identity;
+  PostLinks _links;
+  FilterTable _filters;
+  std::optional<bool> _batchEvents;  // an entry's "expedite"
+  std::int32_t _eventThreshold = 49;
+  std::optional<double> _overrideSampling;
+};
+
+}  // namespace veltrad::backends
