@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <limits>
+#include <utility>
 
 #include "config/client_types.h"
 #include "config/process_settings.h"
@@ -35,44 +36,44 @@ StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _settings(settings), _download(http, settings, veltra) {}
 
-std::optional<Dictionary> StorebagSections::fetchStorebagForEnvironmentAndClientType(
-    std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-    std::optional<std::string>* lastModified, bool& attempted) {
+StorebagAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
+    std::int32_t clientType, const std::optional<std::string>& lastModified) {
+  using Kind = StorebagAnswer::Kind;
   const char* name = storebagNameForClientType(clientType);
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return std::nullopt;
+    return {};
   }
-  const std::optional<Dictionary> storebag =
-      _download.fetchStorebagWithName(name, maxAge, notModified, lastModified, attempted);
-  if (!storebag) {
-    if (!notModified && attempted)
-      logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
-               clientType);
-    return std::nullopt;
-  }
+  StorebagAnswer answer = _download.fetchStorebagWithName(name, lastModified);
+  if (answer.kind == Kind::failed && answer.attempted)
+    logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
+             clientType);
+  if (answer.kind != Kind::fetched) return answer;
+  const Dictionary storebag = std::exchange(answer.content, {});
+  answer.kind = Kind::failed;
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
-    attempted = false;
-    return std::nullopt;
+    answer.attempted = false;
+    return answer;
   }
   const char* sectionName = sectionNameForEnvironment(*environment);
-  const Dictionary* section = sectionOf(*storebag, *environment, sectionName);
+  const Dictionary* section = sectionOf(storebag, *environment, sectionName);
   if (section == nullptr) {
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
-    return std::nullopt;
+    return answer;
   }
-  const std::string* text = storebag->string("version");
-  version = text != nullptr ? std::optional(*text) : std::nullopt;
-  if (const auto cycle = refreshCycleOf(*storebag)) {
-    maxAge = *cycle;
-    logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", maxAge);
+  answer.kind = Kind::fetched;
+  answer.content = *section;
+  if (const std::string* text = storebag.string("version")) answer.version = *text;
+  if (const auto cycle = refreshCycleOf(storebag)) {
+    answer.maxAge = *cycle;
+    logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
   }
-  return *section;
+  return answer;
 }
 
 }  // namespace veltrad::config

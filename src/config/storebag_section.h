@@ -15,9 +15,8 @@ class StorebagSections final : public StorebagSource {
 
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(
-      std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-      std::optional<std::string>* lastModified, bool& attempted) override;
+  StorebagAnswer fetchStorebagForEnvironmentAndClientType(
+      std::int32_t clientType, const std::optional<std::string>& lastModified) override;
 
  private:
   ProcessSettings& _settings;

@@ -55,44 +55,38 @@ std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int3
                                                                        const char* name,
                                                                        RecursiveMutex& lock) {
   logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
-  std::int32_t maxAge = 0;
-  std::optional<std::string> version;
-  bool notModified = false;
-  bool attempted = true;
   if (!name) {
-    std::optional<std::string> lastModified;
-    _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified, &lastModified,
-                                                     attempted);
+    static_cast<void>(_source.fetchStorebagForEnvironmentAndClientType(clientType, std::nullopt));
     return nullptr;
   }
-  std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
+  const std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
   _cachedStorebags[name].beingFetched = true;
   lock.unlock();
-  auto section = _source.fetchStorebagForEnvironmentAndClientType(clientType, maxAge, version, notModified,
-                                                                  &lastModified, attempted);
+  config::StorebagAnswer answer = _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
   lock.lock();
 
+  using Kind = config::StorebagAnswer::Kind;
   StorebagRecord& record = _cachedStorebags[name];
   record.beingFetched = false;
   _fetched.notifyAll();
-  if (!attempted) {
+  if (!answer.attempted) {
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    if (record.data || !section) return record.data;
-    return std::make_shared<const Dictionary>(std::move(*section));
+    if (record.data || answer.kind != Kind::fetched) return record.data;
+    return std::make_shared<const Dictionary>(std::move(answer.content));
   }
-  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", maxAge);
-  record.fetchSuccessful = section.has_value() || notModified;
-  if (section) {
-    record.data = std::make_shared<const Dictionary>(std::move(*section));
-    record.version = std::move(version);
-  } else if (!notModified) {
+  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
+  record.fetchSuccessful = answer.kind != Kind::failed;
+  if (answer.kind == Kind::fetched) {
+    record.data = std::make_shared<const Dictionary>(std::move(answer.content));
+    record.version = std::move(answer.version);
+  } else if (answer.kind == Kind::failed) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
   }
   record.fetchTime = platform::timevalToSeconds(_clock.now());
-  record.maxAge = maxAge;
-  if (lastModified) record.lastModified = std::move(lastModified);
+  record.maxAge = answer.maxAge;
+  if (answer.lastModified) record.lastModified = std::move(answer.lastModified);
   record.attempted = true;
   return record.data;
 }

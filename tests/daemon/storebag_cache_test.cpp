@@ -16,22 +16,22 @@ namespace {
 
 // Answers as the test says; may be told to hold an exchange until it is let go.
 struct Source final : config::StorebagSource {
-  std::optional<Dictionary> fetchStorebagForEnvironmentAndClientType(std::int32_t, std::int32_t& maxAge,
-                                                                     std::optional<std::string>& version,
-                                                                     bool& notModified,
-                                                                     std::optional<std::string>* lastModified,
-                                                                     bool& attempted) override {
-    attempted = attempts;
+  config::StorebagAnswer fetchStorebagForEnvironmentAndClientType(
+      std::int32_t, const std::optional<std::string>& lastModified) override {
+    using Kind = config::StorebagAnswer::Kind;
     std::unique_lock held(mutex);
     ++fetches;
     changed.notify_all();
     changed.wait(held, [this] { return !hold; });
-    conditional = *lastModified;
-    maxAge = age;
-    notModified = answersNotModified;
-    if (section) version = "v" + std::to_string(fetches);
-    if (!newLastModified.empty()) *lastModified = newLastModified;
-    return section;
+    conditional = lastModified;
+    return {section              ? Kind::fetched
+            : answersNotModified ? Kind::notModified
+                                 : Kind::failed,
+            attempts,
+            age,
+            newLastModified.empty() ? lastModified : newLastModified,
+            section.value_or(Dictionary{}),
+            "v" + std::to_string(fetches)};
   }
   void waitForFetches(int count) {
     std::unique_lock held(mutex);
