@@ -157,6 +157,8 @@ std::string percentEncoded(std::string_view text, std::string_view kept) {
 }
 
 std::string escapedForLog(std::string_view text) {
+  const auto plain = [](char c) { return c >= 0x20 && c < 0x7F && c != '\\'; };
+  if (std::all_of(text.begin(), text.end(), plain)) return std::string(text);  // nearly always
   std::string out;
   out.reserve(text.size());
   for (std::size_t i = 0; i < text.size();) {

@@ -84,7 +84,7 @@ std::optional<std::string> VeltradSession::offerToBackends(const BackendSet& set
   for (const auto& [name, backend] : set) {
     auto answer = backend->sendMessage(payload, time, category, type, flag);
     if (!answer) continue;
-    _services.messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", {name, *answer});
+    _services.messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);
     const bool replaces = backend->name() == wire::kVeltraBackendHTTPPost;
     const bool standsIn = backend->name() == wire::kVeltraBackendDashboard && !result;
     if (replaces || standsIn) result = std::move(answer);
@@ -181,7 +181,7 @@ void VeltradSession::internalFlushMessagesWithCompletion(wire::FlushReply comple
         [&flushes, &messageLog, flush, key = name, own = backend->name()](
             const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
           logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
-          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", {key, *answer});
+          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", key, *answer);
           flushes.finished(*flush, answer, error);
         });
   }
@@ -200,9 +200,9 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
     logError("uploadFileWithURL: File upload failed for %s", path.c_str());
   }
   // The full text of the file's address.
-  _services.messageLog.writeToLogFile(
-      "[uploadFileWithURL] Upload %@ for file %@",
-      {uploaded ? "succeeded" : "failed", "file://" + percentEncoded(path, "/!$&'()*+,;=:@")});
+  _services.messageLog.writeToLogFile("[uploadFileWithURL] Upload %@ for file %@",
+                                      uploaded ? "succeeded" : "failed",
+                                      "file://" + percentEncoded(path, "/!$&'()*+,;=:@"));
   if (completionHandler) completionHandler(uploaded);
 }
 
