@@ -96,9 +96,9 @@ StorebagDownload::StorebagDownload(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _http(http), _settings(settings), _veltra(veltra) {}
 
-StorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& name,
-                                                       const std::optional<std::string>& lastModified) {
-  StorebagAnswer answer;
+WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& name,
+                                                            const std::optional<std::string>& lastModified) {
+  WholeStorebagAnswer answer;
   const auto without = [&](const std::string& server, const http::HTTPError& error) {
     answer = withoutAnswer(name, server, error);
     answer.lastModified = lastModified;
@@ -125,14 +125,14 @@ StorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& name,
   answer.attempted = storebag || storebag.error() != Refusal::keyOutOfReach;
   if (!storebag) return answer;
   answer.kind = StorebagAnswer::Kind::fetched;
-  answer.content = std::move(storebag).value();
+  answer.storebag = std::move(storebag).value();
   return answer;
 }
 
-StorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
-                                               const http::HTTPError& error) const {
+WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
+                                                    const http::HTTPError& error) const {
   using Kind = http::HTTPError::Kind;
-  StorebagAnswer answer;
+  WholeStorebagAnswer answer;
   if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
     answer.maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
@@ -145,7 +145,7 @@ StorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, const st
   if (name != kNameWithDefault || error.kind == Kind::stopping) return answer;
   logInfo("fetchStorebagWithName: Loading default storebag '%s'", name.c_str());
   answer.kind = StorebagAnswer::Kind::fetched;
-  answer.content = defaultStorebag();
+  answer.storebag = defaultStorebag();
   return answer;
 }
 

@@ -33,21 +33,25 @@ std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl);
 // What stands in for the storebag "quindle" while its server cannot be reached.
 Dictionary defaultStorebag();
 
+struct WholeStorebagAnswer : StorebagAnswer {
+  Dictionary storebag;  // verified, where it was fetched
+};
+
 // Keeps no state between calls; any number of threads at once. What the constructor takes must outlive it.
 class StorebagDownload {
  public:
   StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  // The whole storebag, verified; without a version. `lastModified`, the "Last-Modified" text of the copy
+  // `lastModified`, the "Last-Modified" text of the copy
   // that the caller holds, makes the request conditional.
-  StorebagAnswer fetchStorebagWithName(const std::string& name,
-                                       const std::optional<std::string>& lastModified);
+  WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
+                                            const std::optional<std::string>& lastModified);
 
  private:
   enum class Refusal { notGenuine, keyOutOfReach };
 
-  StorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
-                               const http::HTTPError& error) const;
+  WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
+                                    const http::HTTPError& error) const;
   Result<Dictionary, Refusal> verifiedStorebag(std::string_view body) const;
 
   http::HTTPClient& _http;

@@ -3,7 +3,6 @@
 
 #include <algorithm>
 #include <limits>
-#include <utility>
 
 #include "config/client_types.h"
 #include "config/process_settings.h"
@@ -36,7 +35,7 @@ StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _settings(settings), _download(http, settings, veltra) {}
 
-StorebagAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
+StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
     std::int32_t clientType, const std::optional<std::string>& lastModified) {
   using Kind = StorebagAnswer::Kind;
   const char* name = storebagNameForClientType(clientType);
@@ -45,12 +44,13 @@ StorebagAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
              clientType);
     return {};
   }
-  StorebagAnswer answer = _download.fetchStorebagWithName(name, lastModified);
+  const WholeStorebagAnswer whole = _download.fetchStorebagWithName(name, lastModified);
+  const Dictionary& storebag = whole.storebag;
+  StorebagSectionAnswer answer{whole, {}, {}};
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
              clientType);
   if (answer.kind != Kind::fetched) return answer;
-  const Dictionary storebag = std::exchange(answer.content, {});
   answer.kind = Kind::failed;
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
@@ -67,7 +67,7 @@ StorebagAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
     return answer;
   }
   answer.kind = Kind::fetched;
-  answer.content = *section;
+  answer.section = *section;
   if (const std::string* text = storebag.string("version")) answer.version = *text;
   if (const auto cycle = refreshCycleOf(storebag)) {
     answer.maxAge = *cycle;

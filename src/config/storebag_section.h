@@ -15,7 +15,7 @@ class StorebagSections final : public StorebagSource {
 
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  StorebagAnswer fetchStorebagForEnvironmentAndClientType(
+  StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) override;
 
  private:

@@ -9,9 +9,10 @@
 
 namespace veltrad::config {
 
+// What came of asking for a storebag.
 struct StorebagAnswer {
-  // fetched: `content` is a storebag, or the section of one. notModified: the copy that the caller holds is
-  // current. failed: neither; the log has said why.
+  // fetched: here it is. notModified: the copy that the caller holds is current. failed: neither; the log has
+  // said why.
   enum class Kind { fetched, notModified, failed };
   Kind kind = Kind::failed;
   // False: for a shortage it could not begin, or its answer not be judged, or the daemon is stopping. Nothing
@@ -21,8 +22,11 @@ struct StorebagAnswer {
   // What makes the next request conditional: the answer's own text, even of one that then did not verify, or
   // what this request was made with.
   std::optional<std::string> lastModified;
-  Dictionary content;
-  std::optional<std::string> version;  // of a section's storebag, where it states one
+};
+
+struct StorebagSectionAnswer : StorebagAnswer {
+  Dictionary section;                  // where it was fetched
+  std::optional<std::string> version;  // then, too: of its storebag, which need not state one
 };
 
 class StorebagSource {
@@ -31,7 +35,7 @@ class StorebagSource {
 
   // The section of the client type's storebag for the process's environment. `lastModified`: of the copy that
   // the caller holds. May block for an exchange with the server; takes no lock of its own.
-  virtual StorebagAnswer fetchStorebagForEnvironmentAndClientType(
+  virtual StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) = 0;
 };
 

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string_view>
 
+#include "base/version.h"
 #include "daemon/daemon.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
@@ -133,7 +134,7 @@ std::optional<int> answerArguments(int count, char** arguments) {
   if (count <= 1) return std::nullopt;
   const std::string_view argument = arguments[1];
   if (count == 2 && argument == "--version") {
-    fmt::print("veltrad {}\n", VELTRAD_VERSION);
+    fmt::print("veltrad {}\n", kVersion);
     return 0;
   }
   if (count == 2 && argument == "--help") {

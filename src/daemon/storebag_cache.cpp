@@ -62,7 +62,7 @@ std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int3
   const std::optional<std::string> lastModified = _cachedStorebags[name].lastModified;
   _cachedStorebags[name].beingFetched = true;
   lock.unlock();
-  config::StorebagAnswer answer = _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
+  auto answer = _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
   lock.lock();
 
   using Kind = config::StorebagAnswer::Kind;
@@ -74,12 +74,12 @@ std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int3
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
     if (record.data || answer.kind != Kind::fetched) return record.data;
-    return std::make_shared<const Dictionary>(std::move(answer.content));
+    return std::make_shared<const Dictionary>(std::move(answer.section));
   }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
   record.fetchSuccessful = answer.kind != Kind::failed;
   if (answer.kind == Kind::fetched) {
-    record.data = std::make_shared<const Dictionary>(std::move(answer.content));
+    record.data = std::make_shared<const Dictionary>(std::move(answer.section));
     record.version = std::move(answer.version);
   } else if (answer.kind == Kind::failed) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);

@@ -24,11 +24,11 @@ const std::string kNotVerified = "3 " + kAt + "Signature can not be verified, 0x
 using Kind = config::StorebagAnswer::Kind;
 
 // One call, its lines and what came of it.
-struct Fetch : config::StorebagAnswer {
+struct Fetch : config::WholeStorebagAnswer {
   Fetch(Configuration& configuration, const Lines& lines) {
     const ExpectedLog log(lines);
     config::StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
-    StorebagAnswer::operator=(download.fetchStorebagWithName("ostvane", std::nullopt));
+    WholeStorebagAnswer::operator=(download.fetchStorebagWithName("ostvane", std::nullopt));
   }
 };
 
@@ -70,7 +70,7 @@ TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
   }
   const Fetch after(configuration, {});
   EXPECT_EQ(after.kind, Kind::fetched);
-  EXPECT_EQ(after.content, kStorebag);
+  EXPECT_EQ(after.storebag, kStorebag);
   EXPECT_TRUE(after.attempted);
 }
 
@@ -117,7 +117,7 @@ TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
   EXPECT_FALSE(config::parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
 }
 
-struct Choice : config::StorebagAnswer {
+struct Choice : config::StorebagSectionAnswer {
   Choice(int environment, const Dictionary& storebag, const Lines& lines,
          const char* cacheControl = "max-age=600") {
     const ExpectedLog log(lines);
@@ -125,7 +125,7 @@ struct Choice : config::StorebagAnswer {
     configuration.answers(container(formats::writeXMLPropertyList(storebag)),
                           {{"Cache-Control", cacheControl}});
     config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
-    StorebagAnswer::operator=(sections.fetchStorebagForEnvironmentAndClientType(5, std::nullopt));
+    StorebagSectionAnswer::operator=(sections.fetchStorebagForEnvironmentAndClientType(5, std::nullopt));
   }
 };
 
@@ -154,7 +154,7 @@ TEST(StorebagSections, ChooseByEnvironment) {
     SCOPED_TRACE(environment);
     const Choice fetch(environment, storebag, lines);
     EXPECT_EQ(fetch.kind, section ? Kind::fetched : Kind::failed);
-    EXPECT_EQ(fetch.content, section.value_or(Dictionary{}));
+    EXPECT_EQ(fetch.section, section.value_or(Dictionary{}));
     EXPECT_EQ(fetch.version, version);
     EXPECT_EQ(fetch.maxAge, 600);
   }

@@ -16,7 +16,7 @@ namespace {
 
 // Answers as the test says; may be told to hold an exchange until it is let go.
 struct Source final : config::StorebagSource {
-  config::StorebagAnswer fetchStorebagForEnvironmentAndClientType(
+  config::StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t, const std::optional<std::string>& lastModified) override {
     using Kind = config::StorebagAnswer::Kind;
     std::unique_lock held(mutex);
@@ -24,12 +24,8 @@ struct Source final : config::StorebagSource {
     changed.notify_all();
     changed.wait(held, [this] { return !hold; });
     conditional = lastModified;
-    return {section              ? Kind::fetched
-            : answersNotModified ? Kind::notModified
-                                 : Kind::failed,
-            attempts,
-            age,
-            newLastModified.empty() ? lastModified : newLastModified,
+    const Kind kind = section ? Kind::fetched : answersNotModified ? Kind::notModified : Kind::failed;
+    return {{kind, attempts, age, newLastModified.empty() ? lastModified : newLastModified},
             section.value_or(Dictionary{}),
             "v" + std::to_string(fetches)};
   }
