@@ -47,8 +47,9 @@ bool makeDirectories(const platform::Root& root) {
   const std::string messageLog = root.messageLogDirectory();
   for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory(), root.logsDirectory(),
                                        messageLog.substr(0, messageLog.rfind('/'))}) {
-    if (const auto failure = platform::makeDirectories(directory)) {
-      logError("main: cannot make a directory that the daemon writes to: %s", failure->description.c_str());
+    if (const auto made = platform::makeDirectories(directory); !made) {
+      logError("main: cannot make a directory that the daemon writes to: %s",
+               made.error().description.c_str());
       return false;
     }
   }

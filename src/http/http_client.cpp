@@ -52,9 +52,8 @@ struct CurlHTTPClient::Impl {
 
   // Any thread
 
-  // Nothing: it was taken.
-  std::optional<HTTPError> file(HTTPRequest request, HTTPCompletion completion, bool blocking);
-  std::optional<HTTPError> startThread();
+  Result<Done, HTTPError> file(HTTPRequest request, HTTPCompletion completion, bool blocking);
+  Result<Done, HTTPError> startThread();
   // False when there is no thread yet.
   bool wake();
 
@@ -84,43 +83,43 @@ struct CurlHTTPClient::Impl {
   Transfers running;
 };
 
-std::optional<HTTPError> CurlHTTPClient::Impl::file(HTTPRequest request, HTTPCompletion completion,
-                                                    bool blocking) {
+Result<Done, HTTPError> CurlHTTPClient::Impl::file(HTTPRequest request, HTTPCompletion completion,
+                                                   bool blocking) {
   try {
-    if (auto error = startThread()) return error;
+    if (auto running = startThread(); !running) return running;
     Transfers one;
     one.emplace_back(std::move(request), std::move(completion), blocking, std::chrono::steady_clock::now());
     const HTTPQueue::Added added = queue.add(one);
     if (added == HTTPQueue::Added::full)
-      return HTTPError{HTTPError::Kind::tooMany, "Too many posts under way"};
+      return Failure{HTTPError{HTTPError::Kind::tooMany, "Too many posts under way"}};
     if (added == HTTPQueue::Added::first) wake();
-    return std::nullopt;
+    return Done();
   } catch (const std::bad_alloc&) {
-    return CurlTransfer::outOfMemory();
+    return Failure{CurlTransfer::outOfMemory()};
   }
 }
 
 // Nothing of libcurl is touched before the first request. What was short is not remembered.
-std::optional<HTTPError> CurlHTTPClient::Impl::startThread() {
-  if (started.load(std::memory_order_acquire)) return std::nullopt;
+Result<Done, HTTPError> CurlHTTPClient::Impl::startThread() {
+  if (started.load(std::memory_order_acquire)) return Done();
   const Lock lock(starting);
-  if (started.load(std::memory_order_relaxed)) return std::nullopt;
+  if (started.load(std::memory_order_relaxed)) return Done();
   const bool initialised = curl_global_init(CURL_GLOBAL_DEFAULT) == CURLE_OK;
   multi.reset(initialised ? curl_multi_init() : nullptr);
   // Without descriptors it is made all the same, but nobody could wake it.
   if (!multi || curl_multi_wakeup(multi.get()) != CURLM_OK)
-    return HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"};
+    return Failure{HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"}};
   curl_multi_setopt(multi.get(), CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
   curl_multi_setopt(multi.get(), CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPQueue::kConnections));
   curl_multi_setopt(multi.get(), CURLMOPT_MAXCONNECTS, 8L);  // kept alive
   try {
     thread = std::thread([this] { run(); });
   } catch (const std::system_error& error) {
-    return HTTPError{HTTPError::Kind::shortage,
-                     std::string("The HTTP thread cannot be started: ") + error.code().message().c_str()};
+    return Failure{HTTPError{HTTPError::Kind::shortage, std::string("The HTTP thread cannot be started: ") +
+                                                            error.code().message().c_str()}};
   }
   started.store(true, std::memory_order_release);
-  return std::nullopt;
+  return Done();
 }
 
 bool CurlHTTPClient::Impl::wake() {
@@ -255,7 +254,7 @@ CurlHTTPClient::~CurlHTTPClient() {
   if (_impl->wake()) _impl->thread.join();
 }
 
-std::optional<HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
+Result<Done, HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
   return _impl->file(std::move(request), std::move(completion), false);
 }
 
@@ -264,9 +263,9 @@ HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
   // The giver may not be done with it when the waiter has gone.
   const auto answer = std::make_shared<std::promise<HTTPResult>>();
   std::future<HTTPResult> given = answer->get_future();
-  auto refusal = _impl->file(
+  const auto taken = _impl->file(
       std::move(request), [answer](HTTPResult result) { answer->set_value(std::move(result)); }, true);
-  if (refusal) return Failure{std::move(*refusal)};
+  if (!taken) return Failure{taken.error()};
   return given.get();
 }
 

@@ -50,12 +50,12 @@ void Counters::writeIfChanged(FileStore& files, const std::string& path, double 
     failedBefore = _failed;
   }
   const Dictionary all{{"pid", static_cast<int>(::getpid())}, {"started", startedAt}, {"counts", snapshot()}};
-  const auto failure = files.replace(path, formats::writeJSON(all) + "\n", 0644);
-  if (failure && !failedBefore)
-    logError("The counters could not be written: %s", failure->description.c_str());
+  const auto written = files.replace(path, formats::writeJSON(all) + "\n", 0644);
+  if (!written && !failedBefore)
+    logError("The counters could not be written: %s", written.error().description.c_str());
   Lock lock(_mutex);
-  _failed = failure.has_value();
-  if (failure) _changed = true;
+  _failed = !written;
+  if (!written) _changed = true;
 }
 
 }  // namespace veltrad::platform

@@ -127,7 +127,8 @@ std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
   DIR* listing = opendir(_directory.c_str());
   if (!listing && errno == ENOENT) {
     logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
-    platform::makeDirectories(_directory);
+    static_cast<void>(
+        platform::makeDirectories(_directory));  // that it failed is said where the file is made
     return std::nullopt;
   }
   if (!listing) {

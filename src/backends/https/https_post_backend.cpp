@@ -262,8 +262,8 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
     auto error = self->handleAnswer(result, postedTo, eventCount);
     if (completion) completion(std::nullopt, std::move(error));
   };
-  if (auto refusal = _services.http.start(std::move(request), answered))
-    answered(Failure{std::move(*refusal)});
+  if (const auto started = _services.http.start(std::move(request), answered); !started)
+    answered(Failure{started.error()});
 }
 
 void HTTPSPostBackend::refusePost(std::size_t eventCount, const FlushCompletion& completion) {
