@@ -127,8 +127,7 @@ std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
   DIR* listing = opendir(_directory.c_str());
   if (!listing && errno == ENOENT) {
     logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
-    static_cast<void>(
-        platform::makeDirectories(_directory));  // that it failed is said where the file is made
+    static_cast<void>(platform::makeDirectories(_directory));  // where it fails, so does making the file
     return std::nullopt;
   }
   if (!listing) {
