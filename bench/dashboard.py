@@ -1,5 +1,5 @@
-"""The dashboard with the programs of VELTRA_BUILD (build/release by default): 10,000 messages a second through 100
-sessions with acknowledgements, for five seconds; and what 1,000 idle sessions with reliable UDP cost."""
+"""Measures the dashboard with the programs in VELTRA_BUILD (by default build/release): 10,000 messages a second from 100
+sessions for five seconds, with acknowledgements; and the CPU time of 1,000 idle sessions with reliable UDP."""
 import json
 import os
 import plistlib
@@ -66,7 +66,7 @@ def main():
             wire.close()
         idle = [join(root, number) for number in range(IDLE)]
         wait_until(lambda: acknowledged() >= sent + 2 * SESSIONS + IDLE, "every acknowledgement")
-        time.sleep(1)  # let the counters be written
+        time.sleep(1)  # until the counters have been written
         used, begin = cpu_seconds(pid), time.monotonic()
         time.sleep(5)
         share = (cpu_seconds(pid) - used) / (time.monotonic() - begin)

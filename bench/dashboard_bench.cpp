@@ -1,5 +1,5 @@
-// One message to a dashboard, built, printed, handed over and sent, beside a bare send of the same bytes.
-// Prints CPU microseconds each; a thread drains the server's socket.
+// Compares a message to a dashboard (packet, text line, queue and send) with a bare send of the same bytes.
+// Prints CPU microseconds of each. A thread reads from the server's socket.
 #include <arpa/inet.h>
 #include <fmt/format.h>
 #include <netinet/in.h>

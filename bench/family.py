@@ -1,5 +1,5 @@
-"""What belonging to a family costs, with the programs of VELTRA_BUILD (build/release by default): daemon CPU a message
-of a root, of a child without and with an aggregating root, and the time of one refresh of a family of 1,000 sessions."""
+"""Measures the cost of families with the programs in VELTRA_BUILD (by default build/release): the daemon's CPU time for a
+message of a root, and of a child with and without an aggregating root, and the time of a refresh of 1,000 sessions."""
 import json
 import os
 import pathlib
@@ -21,7 +21,7 @@ SET = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 
 
 def cpu_seconds(pid):
-    """On all threads, in nanosecond steps."""
+    """CPU time of all threads, with nanosecond resolution."""
     tasks = pathlib.Path(f"/proc/{pid}/task").glob("*/schedstat")
     return sum(int(task.read_text().split()[0]) for task in tasks) / 1e9
 
@@ -53,7 +53,7 @@ def cpu_a_message(pid, wire):
 
 
 def drain(wire):
-    """Reads the copies away, as cheaply as can be."""
+    """Reads and discards the copies."""
     def read():
         wire.socket.settimeout(None)
         while wire.socket.recv(1 << 20):
@@ -62,7 +62,7 @@ def drain(wire):
 
 
 def refresh_milliseconds(root, name):
-    """The root goes and comes back: its return refreshes all below it."""
+    """The root leaves and returns, which refreshes all sessions below it. Returns the median time of the return."""
     wire = join(root, ROOT, "elsewhere")
     took = []
     for _ in range(REFRESHES):
@@ -80,7 +80,7 @@ def main():
     try:
         root.use(lab)
         for kind, name, level in ((ROOT, "quindle", 0), (CHILD, "ostvane", 1)):
-            # Nothing is posted: the back ends are sampled out.
+            # The back ends are sampled out, so nothing is posted.
             entry = {"client": "alone,lonely,family,thousand,elsewhere", "locale_whitelist": ["US"], "filters": [],
                      "sampling_threshold": -1, "override_sampling": -1, "hierarchy": level}
             lab.put(name, storebag(backends={"httppost": {"clients": [entry]}}))

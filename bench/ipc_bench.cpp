@@ -1,6 +1,6 @@
-// What a call costs over a bare socket: the round trip of a message with its reply through a connection of
-// the daemon, against two threads that throw the same bytes to and fro. Prints nanoseconds and the ratio,
-// with both ends on one core and with both free.
+// Compares the round trip of a message and its reply through a connection of the daemon with two threads that
+// exchange the same bytes over a bare socket. Prints nanoseconds and the ratio, with both ends on one core
+// and with both on any core.
 #include <fmt/format.h>
 #include <sched.h>
 #include <sys/socket.h>
@@ -23,7 +23,7 @@ namespace {
 using namespace veltrad;
 using Clock = std::chrono::steady_clock;
 
-// Many short rounds: the best of them are the ones in which nothing else ran.
+// Many short rounds; in the best of them nothing else was running.
 constexpr int kRounds = 400;
 constexpr int kCallsARound = 200;
 
@@ -71,7 +71,7 @@ void pinTo(int core) {
   } else {
     for (unsigned i = 0; i < std::thread::hardware_concurrency(); ++i) CPU_SET(i, &cores);
   }
-  ::sched_setaffinity(0, sizeof cores, &cores);  // threads made later inherit it
+  ::sched_setaffinity(0, sizeof cores, &cores);  // inherited by threads that start later
 }
 
 bool sendAll(int socket, const std::string& bytes) {
@@ -88,7 +88,7 @@ bool receiveAll(int socket, std::size_t size) {
   return true;
 }
 
-// Nanoseconds a round trip, the client's side of it.
+// Nanoseconds per round trip, measured by the client.
 double roundTrip(int socket, const std::string& request, std::size_t replySize, int calls = kCallsARound) {
   const auto start = Clock::now();
   for (int i = 0; i < calls; ++i) {
@@ -116,7 +116,7 @@ double quantile(std::vector<double> values, double part) {
   return values[static_cast<std::size_t>(part * static_cast<double>(values.size() - 1))];
 }
 
-// Alternating rounds, so that both see the same machine.
+// The rounds alternate, so that both run under the same conditions.
 void compare(const char* name, int core) {
   pinTo(core);
   const std::string request = callFrame(1);
@@ -160,7 +160,7 @@ void compare(const char* name, int core) {
         name, label, floor, call, call / floor, request.size(), reply.size());
   }
 
-  // One way: no reply is wanted, the last call's reply ends it.
+  // One way: without replies; the reply to the last call ends the measurement.
   std::string burst;
   for (int i = 0; i < 100; ++i) burst += callFrame(0);
   const auto start = Clock::now();

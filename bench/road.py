@@ -1,6 +1,6 @@
-"""First measures of the whole road, with the programs of VELTRA_BUILD (build/release by default): one client's sends
-beside a bare socket ping-pong, the daemon's CPU a message, its memory, its time to accepting. Ratios hold; single
-figures depend on the machine. With VELTRA_PIN=1 all of it runs on one core."""
+"""Measures the path of a message with the programs in VELTRA_BUILD (by default build/release): sends of one client
+compared with a bare socket ping-pong, the daemon's CPU time per message, its memory, and its start time. Ratios can be
+compared; single figures depend on the machine. With VELTRA_PIN=1 everything runs on one core."""
 import json
 import os
 import pathlib
@@ -27,7 +27,7 @@ def cpu_seconds(pid):
 
 
 def start_milliseconds(root):
-    """From exec to the ready notification's line, and to a connection that is accepted."""
+    """Starts the daemon; returns it and the time from exec until it says that it serves."""
     begin = time.monotonic()
     daemon = Daemon(root, env={"VELTRA_LOG": "info"})
     ready = (time.monotonic() - begin) * 1000
@@ -35,7 +35,7 @@ def start_milliseconds(root):
 
 
 def memory_of_sessions(root):
-    """A fresh daemon's memory after its first posts, and what each further session with one back end adds."""
+    """The memory of a new daemon after its first posts, and the memory of each further session with one back end."""
     daemon = Daemon(root, env={"VELTRA_LOG": "info"})
     command = [program("veltractl"), "--root", str(root.path), "session", "--client-type", "6"]
     clients = []

@@ -1,5 +1,5 @@
-// One client's sends beside a bare socket ping-pong of the same bytes, in one run, interleaved. Prints JSON.
-// Usage: send_bench ROOT (the daemon of that root serves client type 6 with a batching back end)
+// Compares sends of one client with a bare socket ping-pong of the same bytes, interleaved in one run. Prints
+// JSON. Usage: send_bench ROOT (the daemon of that root must serve client type 6 with a batching back end)
 #include <fmt/format.h>
 #include <sched.h>
 #include <sys/socket.h>
@@ -21,7 +21,7 @@ using Clock = std::chrono::steady_clock;
 constexpr int kRounds = 300;
 constexpr int kCallsARound = 100;
 constexpr int kOneWay = 100'000;
-// The frames of such a call and of its answer without a text, header included.
+// The frames of such a call and of its reply without a text, with their headers.
 constexpr std::size_t kCallBytes = 395;
 constexpr std::size_t kReplyBytes = 66;
 
@@ -62,7 +62,7 @@ void bareTrip(int socket) {
   }
 }
 
-// A process that throws back what it gets; on that core alone, unless -1.
+// A process that sends back what it receives; it runs on that core alone, unless -1.
 int bareEnd(int core, pid_t& child) {
   int pair[2];
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, pair) != 0) fail("no socket pair");
@@ -128,8 +128,8 @@ int main(int count, char** arguments) {
     sent.push_back(nanosecondsOf(sendTrip));
     ratios.push_back(sent.back() / bare.back());
   }
-  // What two cores cost by themselves: where the scheduler keeps both bare ends on one, that floor is too
-  // low.
+  // The cost of using two cores: if the scheduler keeps both ends of the bare socket on one core, that floor
+  // is too low.
   double apart = 0;
   cpu_set_t allowed;
   sched_getaffinity(0, sizeof allowed, &allowed);
@@ -152,7 +152,7 @@ int main(int count, char** arguments) {
       sched_yield();
     }
   }
-  sendTrip();  // answered after all of them
+  sendTrip();  // answered after all other calls
   const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
   fmt::print(
       "{{\"bareNs\": {:.0f}, \"bareApartNs\": {:.0f}, \"sendNs\": {:.0f}, \"ratio\": {:.2f}, "

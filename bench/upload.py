@@ -1,5 +1,6 @@
-"""What an upload of 100 MiB costs beside `gzip -6 | curl`, with the programs of VELTRA_BUILD (build/release by default): the
-time of both on the same bytes, alternating, and the daemon's peak of resident memory above its rest. A log's text and noise."""
+"""Compares an upload of 100 MiB with `gzip -6 | curl`, with the programs in VELTRA_BUILD (by default build/release): the
+time of both for the same bytes, alternating, and the daemon's peak of resident memory above rest. The files are log text
+and noise."""
 import os
 import pathlib
 import random

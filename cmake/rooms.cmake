@@ -1,17 +1,17 @@
-# Warnings, sanitizers, and veltra_room(): one library for each folder of src/.
+# Warnings, sanitizers, and veltra_room(), which defines one library for each folder of src/.
 #
-# A room's headers are visible only to the rooms that link it: its include directory is build/rooms/ROOM, which
-# holds nothing but a link to src/ROOM. An include that points up the ladder therefore does not build.
+# A room's headers are visible only to the rooms that link it: its include directory is build/PRESET/rooms/ROOM, which
+# contains only a link to src/ROOM. An include that points up the ladder therefore does not compile.
 
 add_library(veltra_options INTERFACE)
 target_compile_options(veltra_options INTERFACE -Wall -Wextra -Wconversion -Werror -fno-omit-frame-pointer)
 target_compile_options(veltra_options INTERFACE
   $<$<COMPILE_LANG_AND_ID:CXX,Clang>:-Wthread-safety -Wthread-safety-beta>)
-# GCC 12 sees overlaps in std::string's operator+ and uninitialized members in moved variants that are not there.
+# GCC 12 reports overlaps in std::string's operator+ and uninitialized members in moved variants that do not exist.
 target_compile_options(veltra_options INTERFACE "$<$<COMPILE_LANG_AND_ID:CXX,GNU>:-Wno-restrict;-Wno-maybe-uninitialized>")
 if(VELTRA_SANITIZE)
   target_compile_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE} -fno-sanitize-recover=all -O1 -g1)
-  # Its check opens a pipe, and calls a process without descriptors faulty.
+  # The vptr check opens a pipe, so it reports errors in a process that has no free descriptor.
   if(VELTRA_SANITIZE MATCHES "undefined")
     target_compile_options(veltra_options INTERFACE -fno-sanitize=vptr)
   endif()
@@ -23,10 +23,10 @@ if(VELTRA_FUZZ)
   target_compile_options(veltra_options INTERFACE -fsanitize=fuzzer-no-link)
 endif()
 target_link_libraries(veltra_options INTERFACE Threads::Threads)
-# A program loads only the libraries that it uses itself, not all that its rooms could use.
+# A program loads only the libraries that it uses, not all that its rooms link.
 target_link_options(veltra_options INTERFACE -Wl,--as-needed)
 
-# veltra_rung(NAME…): the rooms of the next rung. They know the rooms of the rungs before, and nothing of each other.
+# veltra_rung(NAME…): defines the rooms of the next rung. They may link rooms of lower rungs, but not each other.
 macro(veltra_rung)
   foreach(room ${ARGN})
     add_subdirectory(${room})
@@ -34,7 +34,7 @@ macro(veltra_rung)
   list(APPEND VELTRA_ROOMS_BELOW ${ARGN})
 endmacro()
 
-# veltra_room(NAME [PUBLIC libs…] [PRIVATE libs…] [EXCLUDE regex]): the sources are every .cpp under the folder.
+# veltra_room(NAME [PUBLIC libs…] [PRIVATE libs…] [EXCLUDE regex]): a library of every .cpp file under the current folder.
 function(veltra_room name)
   cmake_parse_arguments(ROOM "" "EXCLUDE" "PUBLIC;PRIVATE" ${ARGN})
   foreach(library ${ROOM_PUBLIC} ${ROOM_PRIVATE})

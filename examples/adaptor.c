@@ -1,6 +1,5 @@
-/* An adaptor bundle: appends what it gets to var/log/veltrad/example-adaptor.jsonl under VELTRA_ROOT, one
- * line
- * {"method":…,"respCode":…,"dict":…} a message. docs/adaptor.md says where it goes. */
+/* An adaptor bundle. It appends every message to var/log/veltrad/example-adaptor.jsonl under VELTRA_ROOT, as
+ * one line {"method":…,"respCode":…,"dict":…}. docs/adaptor.md says where to install it. */
 #define _GNU_SOURCE
 #include <fcntl.h>
 #include <math.h>
@@ -26,7 +25,8 @@ static void put_string(FILE* out, const char* bytes, size_t count) {
 static void put_base64(FILE* out, const unsigned char* bytes, size_t count) {
   static const char digits[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
   for (size_t i = 0; i < count; i += 3) {
-    const unsigned second = i + 1 < count ? bytes[i + 1] : 0, third = i + 2 < count ? bytes[i + 2] : 0;
+    const unsigned second = i + 1 < count ? bytes[i + 1] : 0;
+    const unsigned third = i + 2 < count ? bytes[i + 2] : 0;
     const unsigned bits = (unsigned)bytes[i] << 16 | second << 8 | third;
     fputc(digits[bits >> 18], out);
     fputc(digits[bits >> 12 & 63], out);
@@ -86,14 +86,15 @@ static void put_value(FILE* out, const veltra_adaptor_value* value) {
 static void* create(void) {
   const char* root = getenv("VELTRA_ROOT");
   char* path = NULL;
-  return asprintf(&path, "%s/var/log/veltrad/example-adaptor.jsonl", root ? root : "") < 0 ? NULL : path;
+  if (asprintf(&path, "%s/var/log/veltrad/example-adaptor.jsonl", root ? root : "") < 0) return NULL;
+  return path;
 }
 
 static void destroy(void* path) {
   free(path);
 }
 
-/* One write a line: instances of other sessions write to the same file. */
+/* Each line is one write, because instances of other sessions write to the same file. */
 static void send_message(void* path, uint16_t method, uint16_t resp_code, const veltra_adaptor_value* dict) {
   char* line = NULL;
   size_t length = 0;
@@ -107,7 +108,9 @@ static void send_message(void* path, uint16_t method, uint16_t resp_code, const 
   }
   fputs("}\n", out);
   const int file = open(path, O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0640);
-  if (fclose(out) == 0 && file >= 0 && write(file, line, length) < 0) perror("example adaptor");
+  if (fclose(out) == 0 && file >= 0) {
+    if (write(file, line, length) < 0) perror("example adaptor");
+  }
   if (file >= 0) close(file);
   free(line);
 }

@@ -1,6 +1,6 @@
 #!/usr/bin/env python3
-"""Speaks the wire protocol (docs/wire-protocol.md) with nothing but the standard library: opens a session, starts
-it, sends one message and prints what the daemon answers."""
+"""A client of the wire protocol (docs/wire-protocol.md) that uses only Python's standard library. It opens a session,
+starts it, sends one message and prints the daemon's answer."""
 
 import os
 import plistlib
@@ -23,8 +23,9 @@ class Connection:
             raise ConnectionRefusedError(body["error"]["description"])
 
     def write(self, kind, call, body):
-        body = plistlib.dumps(body, fmt=plistlib.FMT_BINARY)
-        self.socket.sendall(HEADER.pack(len(body), kind, 0, 0, call) + body)
+        data = plistlib.dumps(body, fmt=plistlib.FMT_BINARY)
+        header = HEADER.pack(len(data), kind, 0, 0, call)
+        self.socket.sendall(header + data)
 
     def read_exactly(self, count):
         data = b""
@@ -36,15 +37,17 @@ class Connection:
         return data
 
     def read(self):
-        length, kind, _, _, call = HEADER.unpack(self.read_exactly(HEADER.size))
-        return kind, call, plistlib.loads(self.read_exactly(length))
+        header = self.read_exactly(HEADER.size)
+        length, kind, _, _, call = HEADER.unpack(header)
+        body = self.read_exactly(length)
+        return kind, call, plistlib.loads(body)
 
     def tell(self, op, **args):
-        """A call that wants no answer."""
+        """Makes a call without a reply."""
         self.write(CALL, 0, {"op": op, "args": args})
 
     def ask(self, op, **args):
-        """A call and its answer's results; events that come in between are let pass."""
+        """Makes a call and returns the results of its reply. Events that arrive before it are ignored."""
         self.last_call += 1
         self.write(CALL, self.last_call, {"op": op, "args": args})
         while True:

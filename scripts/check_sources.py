@@ -1,14 +1,15 @@
-"""Format, include ladder, file that must not compile, clang-tidy. Says what is wrong and where; status 1 when anything is."""
+"""Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
+place; the exit status is 1 if there is any."""
 import re
 import subprocess
 import sys
 from pathlib import Path
 
 ROOT = Path(__file__).resolve().parent.parent
-# The ladder stands in src/CMakeLists.txt: a rung a line, lowest first.
+# The ladder is read from src/CMakeLists.txt: one rung per line, lowest first.
 RUNGS = [line.split() for line in re.findall(r"^veltra_rung\((.*)\)$", (ROOT / "src/CMakeLists.txt").read_text(), re.M)]
 RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
-# Backend kinds know nothing of each other.
+# Kinds of back ends, which must not include each other.
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
 LONGEST_BODY = 400
 LONGEST_HEADER = 300
@@ -45,7 +46,7 @@ def check_ladder():
                 found.append(f"{place}: {room} includes {target}, which is not below it")
             kind = parts[2] if room == "backends" and len(parts) > 3 else None
             if kind in KINDS and target == "backends" and match[2].split("/")[0] in set(KINDS) - {kind}:
-                found.append(f"{place}: one kind of backend includes another")
+                found.append(f"{place}: one kind of back end includes another")
     return found
 
 
@@ -66,7 +67,7 @@ def configure():
 
 
 def check_must_not_compile():
-    configure()  # which makes the rooms' include directories
+    configure()  # creates the rooms' include directories
     done = subprocess.run([sys.executable, "tests/must_not_compile/run.py"], cwd=ROOT, capture_output=True, text=True)
     return [] if done.returncode == 0 else done.stdout.splitlines()
 
@@ -88,7 +89,7 @@ def main():
     for name, check in checks.items():
         found = check()
         failed |= bool(found)
-        print(f"{name}: " + ("as it should be" if not found else f"{len(found)} found"))
+        print(f"{name}: " + ("ok" if not found else f"{len(found)} found"))
         for line in found:
             print("  " + line)
     sys.exit(1 if failed else 0)

@@ -1,4 +1,4 @@
-"""Builds the presets named (default: dev asan tsan), runs every test program in each, counts, and says the sum."""
+"""Builds the given presets (default: dev asan tsan), runs every test program in each and prints the totals."""
 import os
 import re
 import subprocess
@@ -47,7 +47,7 @@ def run(command, environment):
     if match := re.search(r"^(\d+) inputs replayed$", output, re.M):
         passed = int(match[1])
     if status != 0 and failed == 0:
-        failed = 1  # crashed, timed out, or a sanitizer's report
+        failed = 1  # it crashed, timed out, or a sanitizer reported an error
     if status == 0 and passed == 0:
         failed, output = 1, output + "\n(ran no test)"
     return passed, failed, output
@@ -84,7 +84,7 @@ def main():
     presets = sys.argv[1:] or PRESETS
     unknown = [preset for preset in presets if preset not in PRESETS]
     if unknown:
-        sys.exit(f"scripts/test: unknown preset {unknown[0]}; there are: {' '.join(PRESETS)}")
+        sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected one of: {' '.join(PRESETS)}")
     passed = failed = 0
     for preset in presets:
         if build(preset):

@@ -1,5 +1,5 @@
-"""Starts a lab and a daemon in a temporary root and plays one act after another. Status 0: what was to arrive did, and
-nothing else."""
+"""Starts a lab and a daemon in a temporary root directory and runs the examples one after another. The status is 0 if
+exactly what should have arrived did arrive."""
 import shlex
 import signal
 import subprocess
@@ -26,15 +26,15 @@ def show_stats(root):
 
 def stay(root, lab):
     control = shlex.join([program("veltractl"), "--root", str(root.path)])
-    heading("Up until Ctrl-C. In another terminal, try:")
+    heading("Running until Ctrl-C. In another terminal, try:")
     print(f"  {control} {shlex.join(call.PHONE)}")
     print("""    and then lines such as {"op":"send","category":5,"type":10,"payload":{"codec":"opus"}}""")
     print(f"  {control} send --client-type 6 --client phone --service ringer --require-user-info "
           "--category 5 --type 10 codec=opus seconds=12.5")
     print(f"  {control} stats")
     print(f"  VELTRA_ROOT={root.path} {program('hello')}")
-    print(f"  open {lab.url}/ in a browser: what arrives, live (the certificate is the lab's own)")
-    print(f"  edit {lab.path}/storebags/ostvane.json: what the daemon is told (signed at each request)", flush=True)
+    print(f"  open {lab.url}/ in a browser: shows what arrives (the certificate is self-signed by the lab)")
+    print(f"  edit {lab.path}/storebags/ostvane.json: the daemon's configuration, signed at each request", flush=True)
     stopped = threading.Event()
     for number in (signal.SIGINT, signal.SIGTERM):
         signal.signal(number, lambda *_: stopped.set())
@@ -43,7 +43,7 @@ def stay(root, lab):
 
 def main():
     root = Root()
-    print(f"starting the lab and the daemon; this run's root is {root.path}", file=sys.stderr)
+    print(f"starting the lab and the daemon; the root directory of this run is {root.path}", file=sys.stderr)
     lab = Lab()
     try:
         root.use(lab)
@@ -51,9 +51,9 @@ def main():
         try:
             problems = [problem for act in ACTS for problem in act.show(root, lab, daemon)]
             show_stats(root)
-            heading("\n".join(problems) or "All that was to arrive did, and nothing else.")
+            heading("\n".join(problems) or "Everything that should arrive has arrived, and nothing else.")
             if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
-                daemon.allow("<")  # whatever is tried
+                daemon.allow("<")  # the user may try anything
                 stay(root, lab)
         finally:
             daemon.stop()

@@ -1,5 +1,5 @@
-"""One call, reported to the collector and to the dashboard: publishes examples/storebag.json, plays examples/call.jsonl and
-examples/lamp.jsonl, and shows both ends of the road."""
+"""A call that is reported to the collector and to the dashboard. Publishes examples/storebag.json, runs examples/call.jsonl
+and examples/lamp.jsonl, and shows what was sent and what arrived."""
 import collections
 import contextlib
 import json
@@ -16,7 +16,7 @@ LAMP = ["session", "--client-type", "6", "--session-id", "43", "--client", "lamp
 
 
 def messages(name):
-    """(category, type) of every message of a client. The session itself reports its start and its end."""
+    """Counts the (category, type) of every message of a client, with those that the session sends at its start and end."""
     lines = [json.loads(line) for line in (EXAMPLES / name).read_text().splitlines()]
     own = [(0, 0), (0, 1)] + [(0, 2) for line in lines if line["op"] == "finish"]
     return collections.Counter(own + [(line["category"], line["type"]) for line in lines if line["op"] == "send"])
@@ -31,7 +31,7 @@ def short(text, length):
 
 
 def posted(reply):
-    """The events in a reply: one text of JSON, or two with words before them."""
+    """The events in a reply: one JSON text, or two, each with a heading."""
     texts = re.split(r"^(?:Flushed events|Standalone event):$", reply, flags=re.M)
     return [event for text in texts if text.strip() for event in json.loads(text)["events"]]
 
@@ -50,7 +50,7 @@ def show_answers(output):
 
 
 def play(root, name, session):
-    """What the client was answered."""
+    """Runs a client and returns its answers."""
     command = [program("veltractl"), "--root", str(root.path), *session, "--input", str(EXAMPLES / name)]
     done = subprocess.run(command, capture_output=True, text=True, timeout=60)
     sys.stderr.write(done.stderr)
@@ -67,7 +67,7 @@ def line_of(event):
 
 def show_posts(posts):
     heading("What arrived at the collector: number, category/type, the client's own fields\n"
-            "(filters have removed peer and hashed number)")
+            "(filters have removed the field \"peer\" and hashed the field \"number\")")
     for post in posts:
         print(f"  POST {post['path']}  {post['bytes']} bytes{', gzip' if post['compressed'] else ''}")
         for name, value in sorted(post["headers"].items()):
@@ -77,7 +77,7 @@ def show_posts(posts):
 
 
 def show_message_log(root):
-    heading("What the owner of the device can read of it: the message log")
+    heading("The message log, which the owner of the device can read")
     for path in sorted((root.path / "var/mobile/Library/Logs/Zentrel/Retired").glob("*.diag")):
         entries = re.split(r"^(?=\(\d{4}-)", path.read_text(), flags=re.M)[1:]
         for entry in entries:
@@ -86,15 +86,15 @@ def show_message_log(root):
 
 
 def check(posts):
-    """What is wrong with what arrived."""
+    """Compares what arrived with what should arrive and returns the problems."""
     events = [event for post in posts for event in post["body"]["events"]]
     arrived, expected = collections.Counter(map(kind, events)), messages("call.jsonl")
     problems = [f"category {c}, type {t}: {arrived[c, t]} of {expected[c, t]} arrived"
                 for c, t in sorted(arrived | expected) if arrived[c, t] != expected[c, t]]
-    problems += ["a field that is to be removed arrived" for event in events if "peer" in event]
-    problems += ["a field that is to be hashed arrived as it was" for event in events
+    problems += ["a field that should be removed arrived" for event in events if "peer" in event]
+    problems += ["a field that should be hashed arrived unchanged" for event in events
                  if not re.fullmatch("[0-9a-f]{64}", event.get("number", "0" * 64))]
-    problems += [f"a post to {post['path']}" for post in posts
+    problems += [f"unexpected post to {post['path']}" for post in posts
                  if (post["path"] == "/collect/realtime") != (kind(post["body"]["events"][0]) == (6, 20))]
     return problems
 
@@ -107,32 +107,32 @@ def check_dashboard(lab):
     with contextlib.suppress(AssertionError):
         wait_until(lambda: len(datagrams(lab)) >= taken(), "the dashboard's datagrams")
     heard = len(datagrams(lab))
-    return [f"the dashboard heard of {heard} messages of {taken()}"] if heard != taken() else []
+    return [f"the dashboard got {heard} of {taken()} messages"] if heard != taken() else []
 
 
 def show_dashboard(lab):
-    heading("What the dashboard heard over UDP, in the clear: number, category/type, the text; each was acknowledged")
+    heading("What the dashboard got over UDP: number, category/type, text (all datagrams were acknowledged)")
     for (session, number), line in sorted(datagrams(lab).items()):
         print(f"  session {session} {number:>3}  {line['method']:>2}/{line['respCode']:<3}{short(line['text'], 80)}")
 
 
 def taken():
-    """How many messages the daemon takes in."""
+    """The number of messages that the daemon takes in."""
     return messages("call.jsonl").total() + messages("lamp.jsonl").total()
 
 
 def show(root, lab, daemon):
-    """What went wrong."""
+    """Runs the example, prints the results and returns the problems."""
     (lab.path / "storebags/ostvane.json").write_bytes((EXAMPLES / "storebag.json").read_bytes())
-    print("playing examples/call.jsonl, then examples/lamp.jsonl, through veltractl session", file=sys.stderr)
+    print("running examples/call.jsonl, then examples/lamp.jsonl, with veltractl session", file=sys.stderr)
     answers = play(root, "call.jsonl", PHONE)
     lamp = play(root, "lamp.jsonl", LAMP)
-    heading("What the phone was answered, which lets its events be batched")
+    heading("The phone's answers (its events are batched)")
     show_answers(answers)
-    heading("What the lamp was answered, which is sampled out at the collector")
+    heading("The lamp's answers (it is sampled out at the collector)")
     show_answers(lamp)
     expected = messages("call.jsonl").total()
-    with contextlib.suppress(AssertionError):  # then check() says which are missing
+    with contextlib.suppress(AssertionError):  # if not, check() says which are missing
         wait_until(lambda: len(lab.events()) >= expected, "the events")
     daemon.wait_for_line("dealloc: VeltradSession dealloc: 43")
     posts = lab.received("events")
@@ -143,5 +143,5 @@ def show(root, lab, daemon):
     if "httppost" in json.loads(lamp.splitlines()[0])["backends"]:
         problems.append("the lamp was told that it reports to the collector")
     if not problems:
-        heading(f"{expected} of {expected} events arrived, none of the lamp's; the dashboard heard of {taken()} messages")
+        heading(f"{expected} of {expected} events of the phone arrived, none of the lamp; the dashboard got {taken()} messages")
     return problems

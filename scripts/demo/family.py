@@ -1,11 +1,11 @@
-"""A family: a root that aggregates and two children of the same identity, each a client of its own."""
+"""A family: a root that aggregates and two children with the same identity. Each is a separate client."""
 import contextlib
 import json
 import sys
 
 from stage import EXAMPLES, Ctl, heading, wait_until
 
-# Client types, which choose the storebag, and with it the place in the family.
+# Client types with their storebags, which give each session its place in the family.
 ROOT, VOICE, VIDEO = (10, "tamberlin"), (8, "brevatto"), (9, "sollwick")
 IDENTITY = ("--client", "phone", "--service", "call", "--require-user-info")
 
@@ -16,7 +16,7 @@ def publish(lab):
 
 
 def play(root):
-    """The lines that the root's client printed."""
+    """Runs the family and returns the lines that the root's client printed."""
     parent = Ctl(root, ROOT[0], "--aggregate", identity=IDENTITY, session_id=1)
     parent.wait_for(lambda lines: any('"start"' in line for line in lines), "the root's start")
     children = [Ctl(root, kind, identity=IDENTITY, session_id=number) for number, (kind, _) in ((2, VOICE), (3, VIDEO))]
@@ -34,7 +34,7 @@ def play(root):
 
 
 def show_copies(lines):
-    heading("The copies that the root's client got, its own among them")
+    heading("The copies that the root's client got, including those of its own messages")
     for line in lines:
         if line["op"] != "aggregated" or not line["sessionInfo"]:
             continue
@@ -43,7 +43,7 @@ def show_copies(lines):
 
 
 def show_ids(posts):
-    heading("Whose events they are at the collector: a child's ID is its root's and its own")
+    heading("The session IDs at the collector: a child's ID is the root's ID followed by its own")
     ids = {}
     for post in posts:
         for event in post["body"]["events"]:
@@ -54,26 +54,26 @@ def show_ids(posts):
 
 
 def taken():
-    """How many messages the daemon takes in: of each its start and stop, of each child two more."""
+    """The number of messages that the daemon takes in: start and stop of each session, and two more of each child."""
     return 2 + 4 + 4
 
 
 def show(root, lab, daemon):
-    """What went wrong."""
+    """Runs the example, prints the results and returns the problems."""
     publish(lab)
-    print("playing a family of three sessions: a root that aggregates, and two children", file=sys.stderr)
-    daemon.allow("Failed to get remote object proxy: The client has gone.")  # the root's last own message
+    print("running a family of three sessions: a root that aggregates, and two children", file=sys.stderr)
+    daemon.allow("Failed to get remote object proxy: The client has gone.")  # for the root's own last message
     lines = play(root)
     for number in (1, 2, 3):
         daemon.wait_for_line(f"dealloc: VeltradSession dealloc: {number}")
 
     def posts():
         return [post for post in lab.received("events") if post["path"] == "/family"]
-    with contextlib.suppress(AssertionError):  # then the IDs are not complete
+    with contextlib.suppress(AssertionError):  # if not, the IDs are incomplete
         wait_until(lambda: sum(len(post["body"]["events"]) for post in posts()) >= taken(), "the family's events")
     show_copies(lines)
     ids = show_ids(posts())
     roots = [name for name in ids if "." not in name]
     if len(ids) != 3 or len(roots) != 1 or not all(name.startswith(roots[0]) for name in ids):
-        return [f"the combined IDs are {ids}"]
+        return [f"wrong combined IDs: {ids}"]
     return []

@@ -1,4 +1,4 @@
-"""What the acts share: where things are, and how a heading looks."""
+"""Paths and helpers that the examples share."""
 import sys
 from pathlib import Path
 

@@ -1,4 +1,4 @@
-"""A file: compressed, uploaded, and removed when the server has confirmed it."""
+"""A file that is compressed, uploaded, and removed when the server has confirmed it."""
 import subprocess
 import sys
 
@@ -8,20 +8,20 @@ IDENTITY = ("--client-type", "6", "--session-id", "44", "--client", "phone", "--
 
 
 def taken():
-    """How many messages the daemon takes in: the session's start and stop."""
+    """The number of messages that the daemon takes in: the session's start and stop."""
     return 2
 
 
 def show(root, lab, daemon):
-    """What went wrong."""
+    """Runs the example, prints the results and returns the problems."""
     file = root.path / "crash report.log"
     file.write_text("".join(f"frame {number}: ring() + {number * 16}\n" for number in range(2000)))
     size = file.stat().st_size
-    print("uploading a file of the phone's through veltractl upload", file=sys.stderr)
+    print("uploading a file with veltractl upload", file=sys.stderr)
     done = subprocess.run([program("veltractl"), "--root", str(root.path), "upload", *IDENTITY, str(file)],
                           capture_output=True, text=True, timeout=60)
     daemon.wait_for_line("dealloc: VeltradSession dealloc: 44")
-    heading("A file that was uploaded")
+    heading("The upload of a file")
     print(f"  {done.stdout.strip()}\n  {done.stderr.strip()}")
     uploads = lab.received("uploads")
     for upload in uploads:

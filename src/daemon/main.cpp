@@ -30,12 +30,12 @@ constexpr auto kTick = 1000ms;  // the watchdog is fed, and counters are handed 
 constexpr const char* kHelp =
     "Usage: veltrad [--version | --help]\n"
     "\n"
-    "Serves clients until SIGTERM or SIGINT. Takes its settings from the environment (VELTRA_ROOT, "
-    "VELTRA_LOG,\n"
-    "VELTRA_LOG_TARGET, VELTRA_SANDBOX) and from the files under etc/veltrad.\n"
+    "Runs in the foreground and serves clients until SIGTERM or SIGINT. Reads its settings from the "
+    "environment\n"
+    "(VELTRA_ROOT, VELTRA_LOG, VELTRA_LOG_TARGET, VELTRA_SANDBOX) and from the files under etc/veltrad.\n"
     "\n"
-    "  --version  Print the version\n"
-    "  --help     Print this\n";
+    "  --version  Print the version and exit\n"
+    "  --help     Print this help and exit\n";
 
 // What is written to later must be there before the sandbox closes.
 bool makeDirectories(const platform::Root& root) {

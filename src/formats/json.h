@@ -21,7 +21,10 @@ Result<Value, JSONError> parseJSON(std::string_view text);
 
 enum class JSONStyle { compact, pretty };
 // The reverse of parseJSON. A real that is not finite is written as null; a text that is no UTF-8 is mended.
-std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact);
+// With `expectedBytes` near its length, the text does not grow, and keep twice its bytes, while it is
+// written.
+std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact,
+                      std::size_t expectedBytes = 0);
 // The beginning of the compact text, at most `most` bytes and whole characters, and how many bytes are left
 // out. Keeps no more than that, however long the text would be.
 struct JSONExcerpt {

@@ -111,8 +111,9 @@ void put(Writer& writer, const Value& value) {
 
 }  // namespace
 
-std::string writeJSON(const Value& value, JSONStyle style) {
+std::string writeJSON(const Value& value, JSONStyle style, std::size_t expectedBytes) {
   std::string out;
+  out.reserve(expectedBytes);
   StringStream stream(out);
   if (style == JSONStyle::pretty) {
     rapidjson::PrettyWriter<StringStream> writer(stream);

@@ -171,9 +171,20 @@ std::size_t expectedMemory(std::string_view body) {
   return std::min(kLeast + 2 * body.size() + kBytesOfObject * objects, wire::kMostCallMemory);
 }
 
+// What a body's control characters add to the texts that are made of it: six bytes each in JSON, of which
+// there are a compact text, a readable one, and copies for the reply and for the log. In a small body they
+// are no matter.
+std::size_t escapesOf(std::string_view body) {
+  constexpr std::size_t kSmallBody = 16u << 10, kMoreBytesEach = 5, kTexts = 5;
+  if (body.size() <= kSmallBody) return 0;
+  const auto controls =
+      std::count_if(body.begin(), body.end(), [](char c) { return static_cast<unsigned char>(c) < 0x20; });
+  return kTexts * kMoreBytesEach * static_cast<std::size_t>(controls);
+}
+
 // Of a call whose values keep so much: what is copied of them and written on the way counts, too.
 std::size_t chargeOf(std::size_t memory, std::string_view body) {
-  return memory + memory / 2 + 2 * body.size() + 4096;
+  return memory + memory / 2 + 2 * body.size() + escapesOf(body) + 4096;
 }
 
 bool chargeCall(CallMemory& memory, std::size_t bytes) {
@@ -189,7 +200,7 @@ bool chargeCall(CallMemory& memory, std::size_t bytes) {
 
 std::string usedUp(CallMemory& memory) {
   memory.usedUp = true;
-  memory.counters.count("call refused: its user's memory is used up");
+  memory.counters.count(wire::Reason::call_over_share);
   return fmt::format("the memory that the daemon keeps for uid {} is used up; try again later",
                      memory.account->uid());
 }

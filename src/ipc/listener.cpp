@@ -170,7 +170,7 @@ bool Listener::acceptOne(std::vector<Arrived>& arrived) {
 std::string Listener::refusalOf(const Peer& peer) {
   if (auto bound = boundReached(peer.uid)) return std::move(*bound);
   if (_entitlements.mayHold(wire::kVeltraEntitlement, peer.uid)) return {};
-  _counters.count("connection refused: the peer does not hold the entitlement");
+  _counters.count(wire::Reason::not_entitled);
   logDebug(
       "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
       SocketConnection::describe(_nextNumber++, peer).c_str());
@@ -180,7 +180,7 @@ std::string Listener::refusalOf(const Peer& peer) {
 // The table of descriptors is full: the spare one lets this client be told, and the queue move on.
 void Listener::acceptWithSpare(int error) {
   warnOfAccept(error);
-  _counters.count("connection refused: no descriptor is left");
+  _counters.count(wire::Reason::no_descriptor);
   _spare.reset();
   FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
   if (socket.isOpen()) {
@@ -208,7 +208,7 @@ void Listener::warnOfAccept(int error) {
 void Listener::admit(FileDescriptor socket) {
   auto peer = peerOfSocket(socket.get());
   if (!peer) {
-    _counters.count("connection refused: the kernel does not say who it is");
+    _counters.count(wire::Reason::peer_unknown);
     return refuseSocket(std::move(socket),
                         "Connection refused: the kernel does not say who you are: " + peer.error());
   }
@@ -219,7 +219,7 @@ void Listener::admit(FileDescriptor socket) {
       std::make_shared<SocketConnection>(number, std::move(socket), std::move(peer.value()), _entitlements,
                                          _lentFiles, _counters, _memory.accountOf(uid));
   if (connection->usable() && startClient(number, uid, connection)) return;
-  _counters.count("connection refused: no thread or descriptor is left");
+  _counters.count(wire::Reason::no_thread);
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");
   warnOfAccept(EAGAIN);
 }
@@ -234,11 +234,11 @@ std::optional<std::string> Listener::boundReached(unsigned uid) {
       return std::nullopt;
   }
   if (all) {
-    _counters.count("connection refused: too many connections");
+    _counters.count(wire::Reason::too_many_connections);
     return fmt::format("Connection refused: {} connections are open, and no more are taken.",
                        _mostConnections);
   }
-  _counters.count("connection refused: too many connections of one user");
+  _counters.count(wire::Reason::too_many_of_user);
   return fmt::format("Connection refused: uid {} has {} connections open, and no more are taken of one user.",
                      uid, _mostConnectionsOfOneUser);
 }
@@ -272,7 +272,7 @@ void Listener::runConnection(std::uint64_t number, SocketConnection& connection)
   if (_delegate.listener(*this, connection.shared_from_this())) {
     connection.run();
   } else {
-    _counters.count("connection refused: the peer does not hold the entitlement");
+    _counters.count(wire::Reason::not_entitled);
     connection.refuse(
         refusedPeer(connection.peer(), connection.peer().unit.value_or("none"), _entitlementsPath));
   }

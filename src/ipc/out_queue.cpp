@@ -38,10 +38,10 @@ OutQueue::OutQueue(FileDescriptor socket, platform::Counters& counters,
 OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
   const Sent sent = put(frame, Kind::reply);
   if (sent == Sent::full) {
-    _counters.count("connection ended: the client does not read its replies");
+    _counters.count(wire::Reason::replies_unread);
     requestEnd();
   } else if (sent == Sent::gone) {
-    _counters.count("reply dropped: the client has gone");
+    _counters.count(wire::Reason::reply_client_gone);
   }
   return sent;
 }
@@ -49,11 +49,11 @@ OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
 OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
   const Sent sent = put(frame, Kind::event);
   if (sent == Sent::full) {
-    _counters.count("event dropped: the client does not read");
+    _counters.count(wire::Reason::client_does_not_read);
   } else if (sent == Sent::gone) {
-    _counters.count("event dropped: the client has gone");
+    _counters.count(wire::Reason::client_gone);
   } else if (sent == Sent::tooLarge) {
-    _counters.count("event dropped: larger than a frame may be");
+    _counters.count(wire::Reason::frame_too_large);
   }
   return sent;
 }

@@ -134,7 +134,7 @@ bool SocketConnection::receive() {
         return violation("More descriptors came than a frame can carry.");
       case SocketReader::Got::noRoom:
         if (!waitForRoom()) {
-          return endWith("connection ended: too many bytes of unfinished frames",
+          return endWith(wire::Reason::unfinished_frames,
                          "Too many bytes of unfinished frames wait in the daemon; try again later.");
         }
     }
@@ -181,7 +181,7 @@ bool SocketConnection::runFrame(const wire::Frame& frame) {
     if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
   } catch (const std::bad_alloc&) {
     // The call's reply, where one is owed, has said that it ended without an answer.
-    _counters.count("call ended: the daemon has no memory left");
+    _counters.count(wire::Reason::call_out_of_memory);
   }
   return true;
 }
@@ -226,17 +226,17 @@ bool SocketConnection::greet(const wire::Frame& frame) {
 }
 
 void SocketConnection::interrupted(const std::string& why) {
-  _counters.count("call refused: it cannot be read");
+  _counters.count(wire::Reason::call_unreadable);
   logDebug("connection: %s sent a call that cannot be read: %s", _description.c_str(), why.c_str());
   if (_interruptionHandler) _interruptionHandler();
 }
 
 bool SocketConnection::violation(const std::string& description) {
-  return endWith("connection ended: the client broke the protocol", description);
+  return endWith(wire::Reason::protocol_broken, description);
 }
 
 // The client is told why, and the connection ends.
-bool SocketConnection::endWith(std::string_view counted, const std::string& description) {
+bool SocketConnection::endWith(wire::Reason counted, const std::string& description) {
   _counters.count(counted);
   logDebug("connection: %s ends: %s", _description.c_str(), description.c_str());
   _out->sendReply(refusalFrame(description));

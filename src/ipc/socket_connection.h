@@ -71,7 +71,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   void poll(short events, int milliseconds = -1);
   void interrupted(const std::string& why);
   bool violation(const std::string& description);
-  bool endWith(std::string_view counted, const std::string& description);
+  bool endWith(wire::Reason counted, const std::string& description);
   void end();
   void writeRest();
   bool overdue() const;

@@ -1,38 +1,43 @@
-// How often each thing happened to a message, by reason. Any thread.
+// How often each thing happened to a message, by reason. Any thread; nothing is locked.
 #pragma once
 
+#include <array>
+#include <atomic>
 #include <cstdint>
-#include <map>
 #include <string>
-#include <string_view>
 
-#include "base/mutex.h"
-#include "base/value.h"
+#include "wire/reasons.h"
 
 namespace veltrad::platform {
 
 class FileStore;
 
-// A reason is a short text that a person can read, "message dropped: the session has no backends": what
-// happened, then why. The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970,
-// "counts": {reason: n}}.
+// The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970, "counts": {text: n}}, with
+// the texts of wire/reasons.def; what never happened is not in it.
 class Counters {
  public:
-  void count(std::string_view reason, std::uint64_t times = 1);
-  std::uint64_t value(std::string_view reason) const;
-  Dictionary snapshot() const;
+  void count(wire::Reason reason, std::uint64_t times = 1) {
+    _counts[static_cast<std::size_t>(reason)].fetch_add(times, std::memory_order_relaxed);
+  }
+  std::uint64_t value(wire::Reason reason) const {
+    return _counts[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
+  }
   // Since the last time that they were written.
-  bool changed() const;
+  bool changed() const { return sum() != _sumWritten.load(std::memory_order_relaxed); }
 
   // Replaces the file (mode 0644) when something changed since the last time; where that fails, it is tried
   // again at the next call, with one error line for an episode. One thread at a time; counters_file.h.
   void writeIfChanged(FileStore& files, const std::string& path, double startedAt);
 
  private:
-  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  std::map<std::string, std::uint64_t, std::less<>> _counts GUARDED_BY(_mutex);
-  bool _changed GUARDED_BY(_mutex) = true;
-  bool _failed GUARDED_BY(_mutex) = false;
+  static constexpr std::uint64_t kNever = UINT64_MAX;
+
+  std::uint64_t sum() const;
+
+  std::array<std::atomic<std::uint64_t>, wire::kReasonCount> _counts{};
+  // Counts only grow, so that an equal sum means the same counts.
+  std::atomic<std::uint64_t> _sumWritten{kNever};
+  bool _failed = false;  // whoever writes alone
 };
 
 }  // namespace veltrad::platform

@@ -48,20 +48,20 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   if (!set) {
     logDebug("sendMessageWithDictionary: No backends available to send message");
     if (origin == Origin::client) {
-      _services.counters.count("message dropped: the session has no back ends");
+      _services.counters.count(wire::Reason::no_backends);
     }
     return std::nullopt;
   }
   const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
-    _services.counters.count("message dropped: category is missing");
+    _services.counters.count(wire::Reason::no_category);
     return std::nullopt;
   }
   const auto type = message.uint32(wire::kVeltraMessageParametersType);
   if (!type) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
-    _services.counters.count("message dropped: type is missing");
+    _services.counters.count(wire::Reason::no_type);
     return std::nullopt;
   }
   const auto category16 = static_cast<std::uint16_t>(*category);
@@ -69,7 +69,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
   const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
-  _services.counters.count("message taken in");
+  _services.counters.count(wire::Reason::message_taken_in);
   sayWithoutUserInfo();
   if (hasAggregator() || getSessionHierarchy() > 0) {
     aggregateMessage(sessionInfo(), platform::timevalToSeconds(time), category16, type16, payload);
@@ -143,7 +143,7 @@ std::optional<std::string> VeltradSession::sendToAggregator(const backends::Shar
                                type, std::move(payload));
   } else {
     failure = "The session has ended.";
-    _services.counters.count("event dropped: the client has gone");
+    _services.counters.count(wire::Reason::client_gone);
   }
   if (!failure) return std::nullopt;
   return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + *failure);
@@ -226,14 +226,14 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
-    _services.counters.count("message dropped: a one-shot message without client type or session ID");
+    _services.counters.count(wire::Reason::no_identifiers);
     return;  // the reply is never given, which ends the client's call
   }
   _sessionID.store(info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0), std::memory_order_relaxed);
   backends::SharedDictionary kept;
   backends::SharedDictionary identity;
   if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
-    _services.counters.count("message dropped: its user keeps too much");
+    _services.counters.count(wire::Reason::message_over_share);
     return;
   }
   keepSessionInfo(kept);
@@ -241,11 +241,11 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
   const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
-    _services.counters.count("message dropped: no storebag for a one-shot message");
+    _services.counters.count(wire::Reason::no_storebag);
     if (reply) reply("storebag not available");
     return;
   }
-  _services.counters.count("message taken in: one-shot");
+  _services.counters.count(wire::Reason::one_shot_taken_in);
   veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _account, true},
       _services.messageLog,

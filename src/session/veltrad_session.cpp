@@ -107,7 +107,7 @@ bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::
 bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDictionary& kept) {
   if (!given) return true;
   kept = keptInfo(std::move(*given), _account);
-  if (!kept) _services.counters.count("session or user info refused: its user keeps too much");
+  if (!kept) _services.counters.count(wire::Reason::info_over_share);
   return kept != nullptr;
 }
 
@@ -126,7 +126,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
   const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
-    _services.counters.count("start without back ends: no storebag");
+    _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
     return;
   }

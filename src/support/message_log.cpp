@@ -96,15 +96,15 @@ void MessageLog::put(std::string_view format, std::initializer_list<std::string_
   using Put = platform::DiskWriter::Queue::Put;
   switch (_queue.put(
       [this, line = std::move(line)] {
-        if (!append(line)) _counters.count("log line lost: the disk did not take it");
+        if (!append(line)) _counters.count(wire::Reason::log_line_disk);
       },
       bytes)) {
     case Put::taken:
       return;
     case Put::full:
-      return _counters.count("log line dropped: 4 MiB of them wait for the disk");
+      return _counters.count(wire::Reason::log_line_queue_full);
     case Put::noThread:
-      return _counters.count("log line dropped: there is no thread to write it");
+      return _counters.count(wire::Reason::log_line_no_thread);
   }
 }
 

@@ -121,13 +121,13 @@ TEST_F(Dashboard, ThePayloadBecomesText) {
     EXPECT_EQ(server.receive().substr(64), c.text);
     EXPECT_TRUE(line && line->ends_with(" 65535     0 " + c.text.substr(0, c.text.size() - c.lostByTheLine)));
   }
-  EXPECT_EQ(world.counters.value("datagram cut: its text is longer than 1023 bytes"), 1u);
+  EXPECT_EQ(world.counters.value(wire::Reason::datagram_cut), 1u);
 }
 
 TEST_F(Dashboard, SoManyLingerOfAUserAndInAllAndTheOldestEnds) {
   platform::MemoryBudget budget;
   const auto threads = entries("/proc/self/task");
-  const char* const ended = "datagram given up: too many dashboards waited after their sessions";
+  const auto ended = wire::Reason::too_many_linger;
   sendAndEnd({});  // nobody's, and the oldest of all: ended last, for want of room in all
   const auto descriptors = entries("/proc/self/fd");
   for (int i = 0; i < 70; ++i) sendAndEnd({budget.accountOf(1)});
@@ -143,7 +143,7 @@ TEST_F(Dashboard, SoManyLingerOfAUserAndInAllAndTheOldestEnds) {
   EXPECT_EQ(world.counters.value(ended), 6u + 9);  // 1 + 64 + 4 * 50 = 265
   world.pool.drain(std::chrono::steady_clock::now());
   world.pool.discard();
-  EXPECT_EQ(world.counters.value("datagram given up: not acknowledged before its back end ended"), 256u);
+  EXPECT_EQ(world.counters.value(wire::Reason::ended_before_acknowledgement), 256u);
   EXPECT_EQ(budget.used(), 0u);
 }
 
@@ -153,11 +153,11 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   platform::MemoryBudget budget(bounds);
   const auto account = budget.accountOf(1);
   for (int i = 0; i < 5; ++i) sendAndEnd({account});  // three fit
-  EXPECT_EQ(world.counters.value("datagram given up: no memory for its dashboard after its session"), 2u);
+  EXPECT_EQ(world.counters.value(wire::Reason::no_memory_to_linger), 2u);
   const auto backend = make({{"reliable", 60'000}}, {account});
   for (int i = 0; i < 20; ++i) backend->sendMessage(nullptr, kTime, 1, 1, 0);
-  EXPECT_GT(world.counters.value("datagram given up: no memory to await its acknowledgement"), 5u);
-  EXPECT_EQ(world.counters.value("datagram sent"), 25u);
+  EXPECT_GT(world.counters.value(wire::Reason::no_memory_to_await), 5u);
+  EXPECT_EQ(world.counters.value(wire::Reason::datagram_sent), 25u);
 
   const FewDescriptors none;
   std::vector<std::shared_ptr<backends::VeltraBackend>> made;

@@ -47,7 +47,8 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
                          {false, {0, 1, 2}, {3}, 3}}) {
     Network network(c.closed);
     backends::MessageQueue queue(c.reliable, false, network.send());
-    EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).sent, !c.closed.contains(0));
+    EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).fate,
+              c.closed.contains(0) ? wire::Reason::datagram_held : wire::Reason::datagram_sent);
     std::size_t givenUp = 0;
     while (!queue.empty() && network.now < 100) {
       ++network.now;
@@ -63,9 +64,11 @@ TEST(DashboardDelivery, SoManyWaitAndTheOldestMakesRoom) {
   for (const auto& [shared, most] : {std::pair{false, 50}, {true, 1024}}) {
     Network network({0});
     backends::MessageQueue queue(false, shared, network.send());
-    EXPECT_TRUE(queue.tryToSendMsg("nobody pays", 0, std::nullopt).notKept);
+    EXPECT_EQ(queue.tryToSendMsg("nobody pays", 0, std::nullopt).fate, wire::Reason::no_memory_to_hold);
     for (int event = 0; event <= most; ++event) {
-      EXPECT_EQ(queue.tryToSendMsg(std::to_string(event), 1, platform::Charge()).pushedOut, event == most);
+      const auto pushedOut = queue.tryToSendMsg(std::to_string(event), 1, platform::Charge()).pushedOut;
+      EXPECT_EQ(pushedOut.has_value(), event == most);
+      if (pushedOut) EXPECT_NE(entryOf(*pushedOut).text.find(std::to_string(most)), std::string_view::npos);
     }
     ++network.now;
     EXPECT_EQ(queue.tick().sent, std::size_t(most));

@@ -70,10 +70,10 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   };
   const auto built = held->sessionIDChanges();
   for (int number : {1, 2, 3, 4}) add(number, built);  // the first makes room for the fourth
-  EXPECT_EQ(counters.value("event dropped: its user keeps too much"), 1u);
+  EXPECT_EQ(counters.value(wire::Reason::event_over_share), 1u);
   EXPECT_EQ(account->used(), 3 * size.charged);
   held->setSessionID(std::string(size.charged / 32, 'n'));  // longer ones keep more: not all of them fit
-  EXPECT_EQ(counters.value("event dropped: its user keeps too much"), 2u);
+  EXPECT_EQ(counters.value(wire::Reason::event_over_share), 2u);
   EXPECT_LE(account->used(), bounds.userKept);
   held->setSessionID("new");
   add(5, built);  // built before, added after
@@ -91,7 +91,7 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   EXPECT_EQ(held->needOf(5, 1, {backends::EventBatch::kMostBytes, 0}), backends::HeldEvents::Need::bound);
   held->add(5, event(7), {backends::EventBatch::kMostBytes, size.charged}, *account->keep(size.charged), 9,
             2);
-  EXPECT_EQ(counters.value("event dropped: the batch is full"), 1u);
+  EXPECT_EQ(counters.value(wire::Reason::batch_full), 1u);
   EXPECT_EQ(held->discard(), 1u);
   EXPECT_EQ(account->used(), 0u);
 }

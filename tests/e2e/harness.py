@@ -1,5 +1,5 @@
-"""Real processes in a directory of their own: the lab, the daemon, its clients. Everything waits on a condition with a
-deadline; nothing sleeps for a result."""
+"""Runs real processes (the lab, the daemon, its clients) in a temporary root directory. Everything waits for a condition,
+with a deadline; nothing sleeps for a result."""
 import atexit
 import contextlib
 import http.client
@@ -20,7 +20,7 @@ import unittest
 
 SOURCE = pathlib.Path(__file__).resolve().parents[2]
 BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "dev")).resolve()
-DEADLINE = float(os.environ.get("VELTRA_DEADLINE", "20"))  # seconds; only a failing test waits so long
+DEADLINE = float(os.environ.get("VELTRA_DEADLINE", "20"))  # seconds; only a failing test waits that long
 ENTITLEMENT = "com.florn.private.veltrad"
 SERVING = "main: Listener resumes with sandbox, start loop."
 DEVICE = {"ProductVersion": "12.1", "BuildVersion": "21B74", "ProductType": "Elm4,2", "DeviceName": "Elm",
@@ -32,7 +32,7 @@ def program(name):
 
 
 def wait_until(condition, what, deadline=DEADLINE, also=lambda: ""):
-    """The first true value of condition(), asked again until the deadline; `also` is said where none came."""
+    """Polls condition() until the deadline and returns its first true value. On failure, the message contains also()."""
     end = time.monotonic() + deadline
     while not (value := condition()):
         if time.monotonic() > end:
@@ -42,11 +42,11 @@ def wait_until(condition, what, deadline=DEADLINE, also=lambda: ""):
 
 
 class Process:
-    """A process whose lines (of one stream) are collected by a thread."""
+    """A process; a thread collects the lines of one of its streams."""
 
     def __init__(self, arguments, env, stream="stderr", **options):
         options.setdefault(stream, subprocess.PIPE)
-        options.setdefault("start_new_session", True)  # a Ctrl-C is ours; it ends them in order
+        options.setdefault("start_new_session", True)  # Ctrl-C reaches only the test, which ends the processes in order
         self.text, self._ended, self._news = [], False, threading.Condition()
         self.popen = subprocess.Popen(arguments, env=env, **options)
         self._stream = getattr(self.popen, stream)
@@ -63,7 +63,7 @@ class Process:
             self._news.notify_all()
 
     def wait_for(self, condition, what, deadline=DEADLINE):
-        """The first true value of condition(lines)."""
+        """Waits until condition(lines) is true and returns its value."""
         with self._news:
             self._news.wait_for(lambda: condition(self.text) or self._ended, deadline)
             if value := condition(self.text):
@@ -72,7 +72,7 @@ class Process:
                                  "\n".join(self.text[-40:]))
 
     def end(self, deadline=DEADLINE):
-        """Waits for the exit; the status."""
+        """Waits for the exit and returns the status."""
         try:
             status = self.popen.wait(deadline)
         except subprocess.TimeoutExpired:
@@ -84,15 +84,15 @@ class Process:
         return status
 
     def descriptors(self):
-        """What each leads to, but for the message log, which is opened when its first line is written."""
+        """The targets of the open descriptors, without the message log, which is opened when its first line is written."""
         names = []
         for link in pathlib.Path(f"/proc/{self.popen.pid}/fd").iterdir():
-            with contextlib.suppress(FileNotFoundError):  # closed meanwhile
+            with contextlib.suppress(FileNotFoundError):  # closed in the meantime
                 names.append(os.readlink(link))
         return sorted(name for name in names if not name.endswith("messageLog.diag"))
 
     def status(self, key):
-        """A number of /proc/PID/status; sizes in KiB."""
+        """A number from /proc/PID/status; sizes are in KiB."""
         lines = pathlib.Path(f"/proc/{self.popen.pid}/status").read_text().splitlines()
         return int(next(line.split()[1] for line in lines if line.startswith(key + ":")))
 
@@ -103,7 +103,7 @@ class Process:
 
 
 class Root:
-    """A directory that stands for "/"."""
+    """A temporary directory that is used as the root directory."""
 
     def __init__(self):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-"))
@@ -112,7 +112,7 @@ class Root:
         self.grant([{"uid": os.getuid(), "entitlements": {ENTITLEMENT: True}}])
 
     def write(self, name, content):
-        """A property list, or bytes as they are."""
+        """Writes a property list, or bytes unchanged."""
         path = self.path / name
         path.parent.mkdir(parents=True, exist_ok=True)
         new = path.with_name(path.name + ".new")
@@ -145,7 +145,7 @@ class Root:
 
 
 class Lab:
-    _keys = None  # made once a test process; later labs start with a copy
+    _keys = None  # created once per test process; later labs start with a copy
 
     def __init__(self, *arguments):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-lab-"))
@@ -176,7 +176,7 @@ class Lab:
             cls._keys = None
 
     def request(self, method, path, body=None, headers={}):
-        """(response, its body)."""
+        """Returns (response, body)."""
         with contextlib.closing(http.client.HTTPSConnection("localhost", self.port, context=self.tls,
                                                             timeout=DEADLINE + 5)) as connection:
             connection.request(method, path, body, headers)
@@ -191,7 +191,7 @@ class Lab:
         assert self.request("DELETE", "/control")[0].status == 200
 
     def put(self, name, storebag, age=100):
-        """Writes the storebag's file, last changed `age` seconds ago."""
+        """Writes the storebag's file, with a modification time `age` seconds ago."""
         path = self.path / "storebags" / f"{name}.plist"
         path.write_bytes(plistlib.dumps(storebag))
         os.utime(path, (time.time() - age,) * 2)
@@ -207,7 +207,7 @@ class Lab:
         return [event for post in self.received("events") for event in post["body"]["events"]]
 
     def wait_for_events(self, count, deadline=DEADLINE, **like):
-        """At least `count` events that have the given fields, in the order of their arrival."""
+        """Waits for at least `count` events with the given fields and returns them in order of arrival."""
         def matching():
             found = [e for e in self.events() if all(e.get(key) == value for key, value in like.items())]
             return found if len(found) >= count else None
@@ -233,14 +233,14 @@ class Daemon(Process):
             self.wait_for_line(SERVING)
 
     def wait_for_line(self, text, count=1, deadline=DEADLINE):
-        """The count-th line that contains the text."""
+        """Waits for the count-th line that contains the text and returns it."""
         def found(lines):
             hits = [line for line in lines if text in line]
             return hits[count - 1] if len(hits) >= count else None
         return self.wait_for(found, f"line {count} with {text!r}", deadline)
 
     def allow(self, *texts):
-        """Warnings and errors that contain one of the texts are expected."""
+        """Marks warnings and errors that contain one of the texts as expected."""
         self.allowed += texts
 
     def unexpected(self):
@@ -248,7 +248,7 @@ class Daemon(Process):
                 or not line.startswith("<")]
 
     def stop(self, within=10, status=0, signals=(signal.SIGTERM,)):
-        """Ends it; the seconds that took. Fails on a wrong status and on lines nobody expected."""
+        """Stops it and returns the seconds that this took. Fails on a wrong status and on unexpected warnings or errors."""
         begin = time.monotonic()
         for number in signals:
             self.popen.send_signal(number)
@@ -265,7 +265,7 @@ IDENTITY = ("--client", "phone", "--service", "ringer", "--require-user-info")
 
 
 class Ctl(Process):
-    """`veltractl session` that is talked to line by line."""
+    """A `veltractl session` process that gets its input line by line."""
 
     def __init__(self, root, client_type=7, *options, identity=IDENTITY, session_id=42):
         self._next = 0
@@ -295,12 +295,12 @@ class Ctl(Process):
 
 
 class Wire:
-    """A client of the bare socket: frames as in docs/wire-protocol.md, well made or not."""
+    """A client on the bare socket that writes frames as in docs/wire-protocol.md, valid or not."""
     HELLO, CALL, REPLY, EVENT, REFUSAL, LARGE_CALL = range(1, 7)
 
     def __init__(self, root, hello=True):
         self.socket = socket.socket(socket.AF_UNIX)
-        self.socket.connect(root.socket)  # waits where the queue is full
+        self.socket.connect(root.socket)  # blocks while the queue is full
         self.socket.settimeout(DEADLINE)
         self._stream, self._call = self.socket.makefile("rb"), 0
         if hello:
@@ -319,7 +319,7 @@ class Wire:
         self.socket.sendall(data)
 
     def frame(self):
-        """(kind, call id, body), or nothing when the daemon has ended the connection."""
+        """Returns (kind, call id, body), or None if the daemon has ended the connection."""
         try:
             head = self._stream.read(12)
             if len(head) < 12:
@@ -334,7 +334,7 @@ class Wire:
         self.send(self.CALL, {"op": op, "args": args}, self._call)
 
     def call(self, op, **args):
-        """The reply's body, events passed over."""
+        """Returns the reply's body and skips events."""
         self.begin(op, **args)
         while frame := self.frame():
             if frame[0] == self.REPLY and frame[1] == self._call:
@@ -353,7 +353,7 @@ class Wire:
 
 
 def storebag(version="v1", backends=None, **more):
-    """One client entry that reports everything to the lab at once; `more` changes it."""
+    """A storebag with one client entry that reports everything to the lab immediately; `more` changes the entry."""
     entry = {"post_url": "${url}/events", "realtime_post_url": "${url}/realtime", "locale_whitelist": ["US"],
              "filters": [], "sampling_threshold": 1, "event_threshold": 49, **more}
     backends = backends or {"httppost": {"display_url": "https://display.example/phone", "clients": [entry]}}
@@ -361,7 +361,7 @@ def storebag(version="v1", backends=None, **more):
 
 
 class SystemTest(unittest.TestCase):
-    """A root, a lab that serves "quindle" and "ostvane", and daemons that are stopped and looked through at the end."""
+    """A root directory, a lab that serves "quindle" and "ostvane", and daemons, which are stopped and checked at the end."""
     lab_arguments = ()
 
     def setUp(self):
@@ -379,7 +379,7 @@ class SystemTest(unittest.TestCase):
         return daemon
 
     def started(self, client_type=7):
-        """A session at the bare socket that has been started."""
+        """Starts a session on the bare socket."""
         wire = Wire(self.root)
         self.addCleanup(wire.close)
         wire.describe(client_type)
@@ -393,12 +393,12 @@ class SystemTest(unittest.TestCase):
         try:
             yield daemon
         except BaseException:
-            daemon.kill()  # the next row of a table can start its own
+            daemon.kill()  # so that the next row of a table can start its own
             raise
         daemon.stop()
 
     def open(self, *arguments, deadline=DEADLINE, **options):
-        """A session that has been started, and what its start answered."""
+        """Starts a session with veltractl; returns it and the answer to its start."""
         ctl = Ctl(self.root, *arguments, **options)
         self.addCleanup(ctl.kill)
         answer = ctl.answer(deadline)
@@ -406,11 +406,11 @@ class SystemTest(unittest.TestCase):
         return ctl, answer["backends"]
 
     def counts(self):
-        """What the daemon that has ended counted."""
+        """The counters of the daemon that has ended."""
         return json.loads((self.root.path / "run/veltrad/counters.json").read_text())["counts"]
 
     def ctl(self, *arguments, input="", status=0, root=None):
-        """Runs veltractl to its end; its answers, and what it said on standard error."""
+        """Runs veltractl until it ends; returns its answers and its standard error."""
         done = subprocess.run([program("veltractl"), *arguments], input=input.encode(), capture_output=True,
                               env=(root or self.root).environment(), timeout=DEADLINE)
         self.assertEqual(done.returncode, status, done.stderr.decode())

@@ -1,8 +1,8 @@
 #!/usr/bin/env python3
-"""Runs the tests with real processes: all of them, or those named (road, test_road.Road.test_examples).
+"""Runs the tests with real processes: all of them, or those given as arguments (road, test_road.Road.test_examples).
 
-VELTRA_BUILD is the build directory, build/dev by default. One process for each class, two at a time. The last line is
-"N passed, N failed"; the status is 1 when any failed."""
+VELTRA_BUILD is the build directory, by default build/dev. Each class runs in its own process, two at a time. The last line
+is "N passed, N failed"; the exit status is 1 if any test failed."""
 import concurrent.futures
 import os
 import pathlib

@@ -1,5 +1,5 @@
-"""A file system that this process serves, in the kernel's own protocol (FUSE, linux/fuse.h): regular files whose
-requests can be left without an answer."""
+"""A file system with regular files that this process serves with the kernel's FUSE protocol (linux/fuse.h). It can leave
+requests unanswered."""
 import contextlib
 import ctypes
 import os
@@ -12,7 +12,7 @@ ENOENT, ENOSYS = 2, 38
 
 
 class Served:
-    """Mounted at `place`, which needs the right to mount. `silent`: the requests that get no answer."""
+    """Mounts itself at `place`, which requires the right to mount. Requests in `silent` get no answer."""
 
     def __init__(self, place, files):
         self.place, self.silent, self.asked = os.fsencode(place), (), []
@@ -33,7 +33,7 @@ class Served:
             self.asked.append(code)
             if code not in self.silent and code != FORGET:
                 error, body = self.answer(code, node, request[40:])
-                with contextlib.suppress(OSError):  # nobody waits for it any more
+                with contextlib.suppress(OSError):  # the caller no longer waits for it
                     os.write(self.device, struct.pack("<IiQ", 16 + len(body), -error, unique) + body)
 
     def attributes(self, node):
@@ -56,6 +56,7 @@ class Served:
         return {RELEASE: 0, FLUSH: 0, LOOKUP: ENOENT}.get(code, ENOSYS), b""
 
     def close(self):
-        """By force: what waits gets an error. Before the daemon is killed, whose end would wait for an answer, too."""
+        """Aborts the file system, so that waiting requests fail. To be called before the daemon is killed, because its end
+        would also wait for an answer."""
         LIBC.umount2(self.place, 1 | 2)
         os.close(self.device)

@@ -1,4 +1,4 @@
-"""The adaptor bundle, good and bad, reached by the built-in storebag without any server."""
+"""Working and faulty adaptor bundles, used through the built-in storebag without a storebag server."""
 import json
 import os
 import shutil
@@ -30,7 +30,7 @@ class Adaptor(SystemTest):
         return [json.loads(line) for line in path.read_text().splitlines()] if path.exists() else []
 
     def is_deaf(self, daemon, line):
-        """A session without a working adaptor: one such line a message, its start and its stop included."""
+        """Runs a session without a working adaptor: one such line per message, including start and stop messages."""
         before = sum(line in said for said in daemon.text)
         session, backends = self.open()
         self.assertEqual(backends, ["mivo"])
@@ -38,7 +38,7 @@ class Adaptor(SystemTest):
         self.assertEqual(session.close(), 0)
         daemon.wait_for_line(line, before + 3)
 
-    def test_messages_as_they_are(self):
+    def test_messages_arrive_unchanged(self):
         shutil.copy(GOOD, self.file)
         payload = {"codec": "opus \u00fc\n\"\\", "seconds": 12.5, "lost": -3, "most": 2**64 - 1, "video": False,
                    "start": {"$date": 1.5e9}, "key": {"$data": "AP/+AQ=="}, "": [1, [], {"deep": {"er": ["x"]}}]}
@@ -55,7 +55,7 @@ class Adaptor(SystemTest):
                 {"method": 65535, "respCode": 65534, "dict": payload},
                 {"method": client_type, "respCode": 0, "dict": None})])
 
-    def test_what_cannot_be_loaded_is_tried_again(self):
+    def test_loading_is_tried_again(self):
         table = [(None, 0, 0o755, "No such file or directory"), (os.devnull, 0o644, 0o755, "file too short"),
                  (GOOD, 0o755, 0o777, THEIRS), (GOOD, 0o775, 0o755, THEIRS)]
         with self.serving(NONE, DEAF.format("(null)")) as daemon:
@@ -75,7 +75,7 @@ class Adaptor(SystemTest):
             self.assertEqual(self.open()[1], ["mivo"])
             wait_until(self.messages, "the start message")
 
-    def test_faulty(self):
+    def test_faulty_adaptors(self):
         deaf, unanswering, thrown = DEAF.format("(null)"), DEAF.partition("{}")[2], "an exception without a text"
         for fault, reason, line in (("otherVersion", "an adaptor of version 2, expected 1", deaf),
                                     ("otherClass", "no class MivoAdaptor among its 1", deaf),
@@ -88,18 +88,18 @@ class Adaptor(SystemTest):
                 self.is_deaf(daemon, line)
                 daemon.wait_for_line(reason)
 
-    def test_an_exit_is_no_end(self):
-        """A service manager starts the daemon again, because its status is that of a failure."""
+    def test_exit_by_the_adaptor_fails_the_daemon(self):
+        """The status is that of a failure, so a service manager restarts the daemon."""
         for fault in ("exits", "exitsQuickly"):
             with self.subTest(fault):
                 shutil.copy(BUILD / f"lib/adaptor_{fault}.so", self.file)
-                daemon, session = self.daemon(), Ctl(self.root)  # the start message goes to the adaptor, too
+                daemon, session = self.daemon(), Ctl(self.root)  # the adaptor gets the start message as well
                 self.addCleanup(session.kill)
                 self.assertEqual(daemon.end(), 1)
                 self.assertIn("code in the process has called exit", daemon.text[-1])
 
-    def test_links_are_looked_at_from_both_ends(self):
-        """Each row: what is at fault on the way, and what a link in the bundle's directory leads to."""
+    def test_links_and_their_targets_are_checked(self):
+        """Each row: the faulty part of the path, and the target of a link in the bundle's directory."""
         inside, outside, foreign = self.file.parent / "inside", self.root.path / "outside", self.root.path / "foreign"
         for directory in (inside, outside, foreign):
             directory.mkdir()

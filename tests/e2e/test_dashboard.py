@@ -1,4 +1,4 @@
-"""The dashboard: datagrams, acknowledgements that are lost or wrong, a server that is not there, the end."""
+"""The dashboard: datagrams, lost and wrong acknowledgements, a missing server, the end of a session."""
 import collections
 import json
 import pathlib
@@ -25,7 +25,7 @@ class Dashboard(HTTPSTest):
             return lines if len(lines) >= count else None
         return wait_until(found, f"{count} datagrams like {like}")
 
-    def test_every_event_arrives_though_acknowledgements_are_lost(self):
+    def test_every_event_arrives_when_acknowledgements_are_lost(self):
         self.report_to(reliable=PERIOD)
         self.lab.control(path="/dashboard", share=30, ack="drop")
         with self.serving():
@@ -44,7 +44,7 @@ class Dashboard(HTTPSTest):
         self.assertGreater(len(lines), sent)
         self.assertLessEqual(max(arrivals.values()), 5)
 
-    # What the dashboard does to one acknowledgement, how often that event then arrives, what is counted.
+    # How one acknowledgement is changed, how often that event then arrives, what is counted.
     WRONG = [({"ack": "duplicate"}, 1, "no such datagram waits"), ({"ack": "short"}, 2, "shorter than 62 bytes"),
              ({"ack": "long"}, 1, None), ({"ack": "foreign"}, 2, "no such datagram waits"),
              ({"ack": "stranger"}, 2, None), ({"delayMs": 100}, 1, None)]
@@ -69,7 +69,7 @@ class Dashboard(HTTPSTest):
         self.report_to(port=port)
         with self.serving(), socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as server:
             client = self.client()
-            for number in range(80):  # each refusal fails the next send, which is held and tried again
+            for number in range(80):  # a refused datagram fails the next send, which is kept and tried again
                 client.message(number=number)
             server.bind(("127.0.0.1", port))
             server.settimeout(DEADLINE)
@@ -86,7 +86,7 @@ class Dashboard(HTTPSTest):
             client = self.client()
             self.assertEqual(client.backends, ["dashboard", "httppost"])
             self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "https://dash.example/1")
-            posted = json.loads(client.message(b="long value", a=1))  # the post's answer comes first
+            posted = json.loads(client.message(b="long value", a=1))  # the reply is the post's, not the dashboard's
             line = self.dashboard(1, method=5)[0]
             expected = {"versionMajor": 8, "componentType": 7, "kind": 1, "sessionID": client.number,
                         "method": 5, "respCode": 2, "deviceID": "ab" * 20, "reliable": True, "length": line["bytes"],
@@ -120,14 +120,14 @@ class Dashboard(HTTPSTest):
         self.assertEqual({int(line["payload"]["number"]) for line in lines}, set(range(sent)))
         self.assertEqual({line["eventID"] for line in lines}, {1})
 
-    def test_the_end_waits_for_acknowledgements_but_not_for_ever(self):
+    def test_the_end_waits_for_acknowledgements_for_a_limited_time(self):
         self.report_to(reliable=PERIOD)
         with self.serving():
             client = self.client()
             self.lab.control(path="/dashboard", ack="drop")
             client.message(number=1)
         counts = self.counts()
-        # Start, message, stop: each was acknowledged, given up or said to be lost.
+        # Start, message, stop: each was acknowledged, given up or logged as lost.
         self.assertEqual(counts["datagram sent"], 3)
         ended = "datagram acknowledged", "datagram given up: never acknowledged", \
             "datagram given up: not acknowledged before its back end ended"

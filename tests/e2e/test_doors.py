@@ -1,4 +1,4 @@
-"""Who gets in, and how the daemon comes and goes."""
+"""Access to the daemon, and its start and stop."""
 import contextlib
 import multiprocessing
 import os
@@ -22,7 +22,7 @@ class Doors(SystemTest):
                     self.root.grant(rules) if isinstance(rules, list) else self.root.write(
                         "etc/veltrad/entitlements.plist", rules or b"")
                     client = Wire(self.root, hello=False)
-                    with contextlib.suppress(ConnectionError):  # more than the daemon will ever read
+                    with contextlib.suppress(ConnectionError):  # more than the daemon reads
                         client.raw(bytes(100_000))
                     kind, call, body = client.frame()
                     self.assertEqual((kind, call, body["error"]["domain"]), (Wire.REFUSAL, 0, "com.florn.veltra.error"))
@@ -48,7 +48,7 @@ class Doors(SystemTest):
                 daemon.wait_for(lambda said: any(re.fullmatch(pattern, one) for one in said), line)
 
     def refused(self, root, words, **options):
-        """A daemon that does not start: status 1 and one error line with the words."""
+        """Checks that the daemon does not start: status 1 and one error line that contains the words."""
         daemon = Daemon(root, serving=False, **options)
         self.addCleanup(daemon.kill)
         self.assertEqual(daemon.end(), 1, daemon.text)
@@ -56,7 +56,7 @@ class Doors(SystemTest):
         self.assertEqual(len(errors), 1, daemon.text)
         self.assertIn(words, errors[0])
 
-    def test_second_daemon_stale_and_foreign_files(self):
+    def test_second_daemon_and_files_in_the_place_of_the_socket(self):
         with self.serving():
             self.assertEqual(os.stat(self.root.socket).st_mode & 0o777, 0o666)
             self.refused(self.root, str(self.root.path / "run/veltrad"))
@@ -64,7 +64,7 @@ class Doors(SystemTest):
         killed = self.daemon()
         killed.kill()
         self.assertTrue(os.path.exists(self.root.socket))
-        with self.serving():  # takes the stale socket's place
+        with self.serving():  # replaces the stale socket
             self.assertEqual(self.open()[1], ["httppost"])
         self.assertFalse(os.path.exists(self.root.socket))
         with open(self.root.socket, "w") as foreign:
@@ -73,14 +73,14 @@ class Doors(SystemTest):
         with open(self.root.socket) as foreign:
             self.assertEqual(foreign.read(), "mine")
 
-    def test_root_that_does_not_fit(self):
+    def test_unusable_root_directories(self):
         self.root.path = self.root.path / ("deep" * 25)
         self.root.path.mkdir()
         self.refused(self.root, "deepdeep")
         self.root.path = self.root.path.parent
 
     def test_socket_activation_and_service_manager(self):
-        """Descriptor 3 is the listener; the service manager hears of readiness, of the transaction and of the end."""
+        """Descriptor 3 is the listener; the service manager is notified of readiness, of the transaction and of the end."""
         os.makedirs(os.path.dirname(self.root.socket))
         notify = str(self.root.path / "notify")
         wrapper = ("import os, sys; os.dup2(int(sys.argv[1]), 3); os.environ.update(LISTEN_FDS='1', "
@@ -109,7 +109,7 @@ class Doors(SystemTest):
 
 
 class Crowd(SystemTest):
-    def test_a_refused_user_holds_nobody_up(self):
+    def test_a_refused_user_delays_nobody(self):
         def flood():
             os.setuid(65534)
             while True:
@@ -133,7 +133,7 @@ class Crowd(SystemTest):
                 for one in crowd:
                     one.kill()
                     one.join()
-            # 0.1 s on a machine of its own; here other tests run beside it.
+            # 0.1 s on an idle machine; here other tests run at the same time.
             self.assertLess(sorted(waits)[-3], 0.1 if BUILD.name == "release" else 0.3, "seconds to a greeting at the 99th percentile")
 
 
@@ -149,7 +149,7 @@ class Stop(SystemTest):
         self.assertEqual(len([e for e in events if (e["_method"], e["_status"]) == (0, 1)]), 3)
         self.assertFalse(os.path.exists(self.root.socket))
 
-    def test_a_collector_that_hangs_ends_within_ten_seconds_and_at_once_by_two_signals(self):
+    def test_a_hanging_collector_delays_a_stop_by_ten_seconds_unless_a_second_signal_comes(self):
         self.lab.control(path="/events", stall=True)
         with self.serving("HTTPSPostBackend(postJsonMessage): post error: "):
             self.open()[0].send()
@@ -163,7 +163,7 @@ class Stop(SystemTest):
     def test_download_is_given_up(self):
         self.lab.control(path="/storebags", stall=True)
         daemon = self.daemon()
-        for client_type in (6, 7):  # "quindle" has a default, which is not for a stop
+        for client_type in (6, 7):  # "quindle" has a default, which is not used during a stop
             self.addCleanup(Ctl(self.root, client_type).kill)
         self.lab.received("storebags", 2)
         self.assertLess(daemon.stop(), 5)

@@ -1,4 +1,4 @@
-"""The energy log: many clients at once, rotation by the system's own tool, a full disk, a link in its place."""
+"""The energy log: many clients at once, rotation by logrotate, a full disk, a link in place of the file."""
 import concurrent.futures
 import json
 import resource
@@ -6,7 +6,7 @@ import subprocess
 
 from harness import SOURCE, SystemTest, storebag, wait_until
 
-COUNT = 300  # messages a client
+COUNT = 300  # messages per client
 LOST = "logRegisteredEvent: The energy log cannot be written, events are lost: "
 UNSERVED = "MivoBackend(initWithName): No matching bundle found for client type 6"
 
@@ -19,7 +19,7 @@ class Energy(SystemTest):
         self.file = self.directory / "energy.jsonl"
 
     def events(self, who=None):
-        """Of all files, rotated ones first."""
+        """The lines of all files, rotated ones first."""
         files = sorted(self.directory.glob("energy.jsonl*"), reverse=True)
         lines = [json.loads(line) for file in files for line in file.read_bytes().splitlines()]
         return [line for line in lines if who is None or line["event"]["who"] == who]
@@ -63,10 +63,10 @@ class Energy(SystemTest):
     def test_a_full_disk_and_a_link(self):
         with self.serving(UNSERVED, LOST) as daemon:
             session, _ = self.open(6)
-            session.send(who=1, filling="x" * 70_000)  # beyond what the daemon's other files need
+            session.send(who=1, filling="x" * 70_000)  # more than the daemon's other files need
             pid, hard = daemon.popen.pid, resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE)[1]
             size = self.file.stat().st_size
-            resource.prlimit(pid, resource.RLIMIT_FSIZE, (size + 50, hard))  # in the middle of the next line
+            resource.prlimit(pid, resource.RLIMIT_FSIZE, (size + 50, hard))  # ends in the middle of the next line
             for _ in range(3):
                 self.assertIsNone(session.send(who=2)["reply"])
             self.assertIn("no room for ", daemon.wait_for_line(LOST))
@@ -82,7 +82,7 @@ class Energy(SystemTest):
             daemon.wait_for_line(LOST, 2)
             self.file.unlink()
             session.send(who=5)
-            with open(self.file, "ab") as torn:  # by a daemon that was killed within a line
+            with open(self.file, "ab") as torn:  # as if the daemon had been killed while writing a line
                 torn.write(b'{"client": 28, "na')
             session.send(who=6)
             *lines, half, last = self.file.read_bytes().splitlines()

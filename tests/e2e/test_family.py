@@ -1,4 +1,4 @@
-"""Sessions of one identity: combined IDs, states from the parent, copies to the one client that aggregates."""
+"""Families of sessions: combined IDs, states from the parent, copies to the client that aggregates."""
 import concurrent.futures
 import re
 import time
@@ -14,7 +14,7 @@ END = {"timestamp": 0.0, "category": 0, "type": 0}
 
 
 class Member(Client):
-    """A session of the family, which keeps the copies that it gets."""
+    """A session of the family that stores the copies it gets."""
 
     def __init__(self, root, client_type, aggregates=False, name="phone", service="ringer", batch=False):
         self.copies = []
@@ -26,7 +26,7 @@ class Member(Client):
         return frame
 
     def copies_now(self):
-        """What came since the last look; an answered call shows that it is all."""
+        """The copies since the last call of this function. A call that was answered shows that all have arrived."""
         self.ask("fetchDisplayURL:")
         taken, self.copies = self.copies, []
         return taken
@@ -47,7 +47,7 @@ class Family(HTTPSTest):
         return member
 
     def ids(self, level, events):
-        """The "_sessionID" of the newest events of a level."""
+        """The "_sessionID" of the newest event of a level, after at least `events` events."""
         def found():
             came = [event["_sessionID"] for post in self.posts(str(level)) for event in post["body"]["events"]]
             return came[-1] if len(came) >= events else None
@@ -61,7 +61,7 @@ class Family(HTTPSTest):
         with self.serving():
             root = self.join(ROOT, aggregates=True)
             child = self.join(CHILD, aggregates=True, name="PHONE", service="Ringer")
-            self.assertEqual(child.copies_now(), [END])  # an ancestor aggregates: this one's copies end
+            self.assertEqual(child.copies_now(), [END])  # an ancestor aggregates, so this one's copies end
             grandchild = self.join(GRANDCHILD, name="Phone")
             root.copies_now()
             members, sent = (root, child, grandchild), 100
@@ -80,13 +80,13 @@ class Family(HTTPSTest):
             ids = [self.ids(level, 1 + sent).split(".") for level in range(3)]
             self.assertEqual([len(each) for each in ids], [1, 2, 3])
             self.assertEqual((ids[2][:2], ids[1][:1]), (ids[1], ids[0]))
-            # An equal number: the first that came stays the root, and a stranger belongs to no family.
+            # A second session with the same number: the first one stays the root. A stranger belongs to no family.
             late, stranger = self.join(ROOT, aggregates=True), self.join(GRANDCHILD, name="tablet")
             late.copies_now(), root.copies_now()
             child.message(number=9), stranger.message(number=9)
             self.assertEqual([len(member.copies_now()) for member in (root, late, stranger)], [1, 0, 0])
 
-    def test_members_come_late_and_go(self):
+    def test_members_join_late_and_leave(self):
         with self.serving(PROXY + "The client has gone.") as daemon:  # the root's own last message
             grandchild = self.join(GRANDCHILD, batch=True)
             daemon.wait_for_line(f"<6>syncReportingStates: child session {grandchild.number} (backend httppost) with "
@@ -98,19 +98,19 @@ class Family(HTTPSTest):
             self.assertEqual(grandchild.flush()[1:], (None, None))
             self.assertEqual(self.ids(2, 2).count("."), 2)  # batched before the family was whole
             root.copies_now()
-            child.states(clientName="tablet", serviceName="ringer")  # another identity: out of the family
+            child.states(clientName="tablet", serviceName="ringer")  # another identity, so it leaves the family
             child.message(number=2)
             self.assertEqual(root.copies_now(), [])
-            grandchild.message(number=3)  # its root is found over the gap
+            grandchild.message(number=3)  # its root is found although a level is missing
             self.assertEqual([copy["payload"]["number"] for copy in root.copies_now()], [3])
             self.leave(daemon, root)
             grandchild.message(number=4)
-            child.states(clientName="PHONE", serviceName="ringer")  # back: its root is missing, itself is not
+            child.states(clientName="PHONE", serviceName="ringer")  # it is back, and only the root is missing
             grandchild.message(number=5)
             self.assertEqual(grandchild.flush()[1:], (None, None))
             self.assertEqual(self.ids(2, 5).count("."), 1)
 
-    def test_a_session_whose_user_info_has_gone_is_forgotten(self):
+    def test_a_session_without_user_info_any_more_leaves_its_family(self):
         with self.serving("user info provided without requiring it") as daemon:
             member = self.join(ROOT)
             member.ask(DESCRIBE, sessionInfo={"clientType": ROOT, "sessionID": member.number}, userInfo={},
@@ -120,7 +120,7 @@ class Family(HTTPSTest):
             daemon.wait_for_line(f"syncReportingStates: child session {child.number} (backend httppost) with hierarchy 1 is "
                                  "missing its parent")
 
-    # What the entries of parent and child say, the answer of the parent's collector, whether the child reports.
+    # Entries of parent and child, status of the parent's collector, whether the child reports.
     OUT, HELD = {"sampling_threshold": 0, "override_sampling": 0}, {"sampling_threshold": 0}
     STATES = [({}, {}, 200, True), (OUT, {}, 200, False), (HELD, {}, 200, True), ({}, OUT, 200, True),
               (OUT, HELD, 200, True), ({}, {}, 503, False)]
@@ -129,7 +129,7 @@ class Family(HTTPSTest):
         def entries(level, which):
             return [entry(f"case{number}", hierarchy=level, **case[which]) for number, case in enumerate(self.STATES)]
         self.bag(ROOT, *entries(0, 0))
-        self.bag(CHILD, *entries(1, 1), httppost2={"clients": [entry(client=None, hierarchy=1)]})  # the parent lacks it
+        self.bag(CHILD, *entries(1, 1), httppost2={"clients": [entry(client=None, hierarchy=1)]})  # not the parent's
         with self.serving() as daemon:
             for number, (*_, status, reports) in enumerate(self.STATES):
                 with self.subTest(number):
@@ -141,13 +141,13 @@ class Family(HTTPSTest):
                     self.assertEqual(child.backends, ["httppost"] * reports)
             daemon.wait_for_line("<7>HTTPSPostBackend(syncReportingStates): httppost: state and sampling rate updated to 1")
 
-    def test_a_client_that_does_not_read_holds_up_nobody(self):
+    def test_a_client_that_does_not_read_delays_nobody(self):
         with self.serving(PROXY) as daemon:
             root, child = self.join(ROOT, aggregates=True, batch=True), self.join(CHILD, batch=True)
             root.message(text="x" * 100_000)
             root.copies_now()
             self.lab.control(path="/events/0", stall=True)
-            root.begin("flushMessagesWithCompletion:")  # answered when the copies have long filled its queue
+            root.begin("flushMessagesWithCompletion:")  # answered after the copies have filled its queue
             self.posts("0", 1)
             begin, sent, text = time.monotonic(), 4000, "x" * 1000
             for number in range(sent):
@@ -166,6 +166,6 @@ class Family(HTTPSTest):
         self.assertTrue(1 <= len(lines) <= took + 3, lines)
         counts = self.counts()
         self.assertEqual(counts["event dropped: the client does not read"], sent - len(numbers))
-        # Nothing is lost without a line, the last two at the session's end included.
+        # The lines account for every lost copy, including the last two at the end of the session.
         said = [int(re.search(r"(?:\((\d+) copies since the last such line\))?$", line)[1] or 1) for line in lines]
         self.assertEqual(sum(said), sent - len(numbers) + counts["event dropped: the client has gone"])

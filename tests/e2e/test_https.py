@@ -1,4 +1,4 @@
-"""The HTTPS post back end: client entries, filters, batches, collectors with moods, hostile texts, the message log."""
+"""The HTTPS back end: client entries, filters, batches, collectors that fail on request, hostile texts, the message log."""
 import collections
 import contextlib
 import datetime
@@ -19,14 +19,14 @@ POST_ERROR = "<3>HTTPSPostBackend(postJsonMessage): post error: "
 
 
 def entry(name="phone", **more):
-    """A client entry for one client that posts to a path of its own; None leaves a key out."""
+    """A client entry for one client, with its own path at the collector. None removes a key."""
     keys = {"client": name, "post_url": "${url}/events/" + name, "locale_whitelist": ["US"], "filters": [],
             "sampling_threshold": 1, "event_threshold": 49, **more}
     return {key: value for key, value in keys.items() if value is not None}
 
 
 class Client(Wire):
-    """A started session. Every reply must be the one to the call that was made last."""
+    """A started session. Checks that every reply belongs to the call that was made last."""
     numbers = itertools.count(1)
 
     def __init__(self, root, name="phone", client_type=7, user_info={}, aggregates=False, **session_info):
@@ -56,7 +56,7 @@ class Client(Wire):
         return json.loads(self.message(**message))["events"][-1]
 
     def flush(self):
-        """(reply, error's code, its description)."""
+        """Flushes and returns (reply, error code, error description)."""
         answer = self.ask("flushMessagesWithCompletion:")
         error = answer.get("error", {})
         return answer.get("reply"), error.get("code"), error.get("description")
@@ -65,7 +65,7 @@ class Client(Wire):
         return self.ask("fetchStatesWithUserInfo:completionHandler:", userInfo=user_info).get("backends")
 
     def mark(self, daemon):
-        """The daemon's lines about this session so far."""
+        """The daemon's log lines about this session so far."""
         self.ask("fetchDisplayURL:")
         daemon.wait_for_line(f"fetchDisplayURL: Fetching display URL for session {self.number}")
         lines = daemon.text
@@ -83,7 +83,7 @@ class HTTPSTest(SystemTest):
         return client
 
     def posts(self, name, count=0):
-        """At least `count` posts to the client entry's own path."""
+        """Waits for at least `count` posts to the client entry's path and returns them."""
         def found():
             hits = [post for post in self.lab.received("events") if post["path"] == "/events/" + name]
             return (hits, ) if len(hits) >= count else None
@@ -100,7 +100,7 @@ class HTTPSTest(SystemTest):
 
 
 class Entries(HTTPSTest):
-    # By consent and LANG: the entry's changes, reports / held / why it is disabled, a part of the line that says it.
+    # For each consent and LANG: changes to the entry; reports, held or the reason why not; a part of the log line.
     DECISIONS = {(True, "en_US.UTF-8"): [
         ({}, "reports", "state=2"), ({"locale_whitelist": ["DE", "us"]}, "reports", "state=2"),
         ({"locale_whitelist": ["DE"]}, COUNTRY, '(US) isn\'t in country code list ["DE"]'),
@@ -120,7 +120,7 @@ class Entries(HTTPSTest):
         ({"client": "desk,{NAME}"}, "reports", "state=2"), ({"client": "desk, {NAME}"}, "no client entry fits", ""),
         ({"service": "lamp,{NAME}"}, "reports", "state=2"), ({"service": "{NAME}x"}, "no client entry fits", ""),
         ({"override_dnu": 1}, "reports", "state=2"),
-        # A value of a wrong type is as if it were absent.
+        # A value of the wrong type counts as absent.
         ({"locale_whitelist": "US"}, COUNTRY, "(US) isn't in country code list"),
         ({"filters": {"key": "x"}}, "the client entry has no filters", "filters are"),
         ({"sampling_threshold": "1"}, "the client entry has no sampling threshold", "state=1"),
@@ -147,7 +147,7 @@ class Entries(HTTPSTest):
         client.message(9, 9)
         self.assertEqual(client.flush()[1:], (-1, "Nothing to flush"))
         client.close()
-        # Start, message, stop; what is held is never posted.
+        # Start, message, stop; held events are never posted.
         expected = 3 if outcome == "reports" else 0
         posts = self.posts(name, expected)
         self.assertEqual(len(posts), expected)
@@ -222,7 +222,7 @@ class Events(HTTPSTest):
                           for name in ("phone", "slow", "urgent")], [{None}, {None}, {"5 2"}])
         self.assertEqual(self.counts()["event posted"], 14)
 
-    def test_held_by_sampling_until_the_flag(self):
+    def test_sampled_out_messages_are_held_until_one_overrides_it(self):
         self.serve(entry(sampling_threshold=-1, override_sampling=0.5))
         with self.serving():
             silent, heard = self.client(batchEvent=True), self.client()
@@ -255,12 +255,12 @@ class Events(HTTPSTest):
             post, = self.posts("phone", 1)
             client.close()
         seen = [[event.get(key) for key in payload] for event in post["body"]["events"][1:]]
-        # The user info is filtered once more for the flush, as method 0 and status 0.
+        # For the flush the user info is filtered again, with method 0 and status 0.
         self.assertEqual(seen, [[None, secret, "opus", one, None, 1], [None, secret, "opus", one, None, 1],
                                 [None, secret, opus, one, None, 1]])
         self.assertNotIn('"secret"', json.dumps(post))
 
-    def test_the_limit_counts_by_the_event_s_own_method(self):
+    def test_the_threshold_is_not_affected_by_a_filter_on_the_method(self):
         self.serve(entry(event_threshold=2, filters=[{"key": "_method", "action": "remove"}]))
         with self.serving():
             client = self.client(batchEvent=True)
@@ -271,7 +271,7 @@ class Hostile(HTTPSTest):
     TEXTS = ['"quoted\\"', "line\r\nX-Evil: 1\r\n\r\n", "nul\0after", "\u202ereversed\u2066", "\u2028\u2029\x85",
              "\x1b[31mred\x7f", "ünïcödé 🦉", "%s%n%@", "x" * (200 << 10)]
 
-    def test_texts_break_nothing(self):
+    def test_hostile_texts(self):
         self.serve(entry(client=None))
         payload = {f"key{n} {text[:30]}": text for n, text in enumerate(self.TEXTS)}
         removed = {"list": [["a\nb"]], "more": {"a\n": "b"}, "raw": b"\0", "nan": float("nan"), "\n<3>faked": [1]}
@@ -310,10 +310,10 @@ class MessageLog(HTTPSTest):
                              ["flushMessages", "sendMessageWithDictionary", "flushMessages"])
 
 
-class Moods(HTTPSTest):
+class Failures(HTTPSTest):
     URLS = {"refused": f"https://localhost:{closed_port()}/events", "nowhere": "https://collector.invalid/"}
-    # The collector's mood, the code and text of the error that the flush reports, how many posts arrive.
-    MOODS = [
+    # Name, how the collector fails, code and text of the error that the flush reports, how many posts arrive.
+    FAILURES = [
         ("well", {}, (None, None), 1), ("missing", {"status": 404}, (None, None), 1),
         ("redirect", {"status": 302, "headers": {"Location": "/events/elsewhere"}}, (None, None), 1),
         ("dripping", {"dripMs": 10, "body": "x" * 20}, (None, None), 1), ("stalled", {"stall": True}, (None, None), 1),
@@ -322,11 +322,11 @@ class Moods(HTTPSTest):
          (503, "backend httppost disabled by server 503 return code"), 1),
         ("cut", {"cut": True}, (-1, "Empty reply from server"), 1),
         ("halfway", {"cutHalfway": True, "body": "xxxx"}, (-1, "transfer closed with 2 bytes remaining to read"), 1),
-        ("endless", {"endless": True}, (None, None), 1),  # nobody reads it: the status counts
+        ("endless", {"endless": True}, (None, None), 1),  # the body is not read; the status counts
         ("refused", {}, (-1, "Failed to connect to localhost port "), 0),
         ("nowhere", {}, (-1, "Could not resolve host: collector.invalid"), 0)]
 
-    def flush_in_a_mood(self, daemon, name, rule, expected, arrived):
+    def flush_at_a_failure(self, daemon, name, rule, expected, arrived):
         client = self.client(name, batchEvent=True)
         client.message(number=1)
         self.lab.control(path="/events/" + name, **rule)
@@ -347,18 +347,18 @@ class Moods(HTTPSTest):
         client.close()
 
     def test_each_flush_is_answered_once(self):
-        self.serve(*(entry(name, post_url=self.URLS.get(name, "${url}/events/" + name)) for name, *_ in self.MOODS))
+        self.serve(*(entry(name, post_url=self.URLS.get(name, "${url}/events/" + name)) for name, *_ in self.FAILURES))
         with self.serving(POST_ERROR) as daemon:
-            for mood in self.MOODS:
-                with self.subTest(mood[0]):
-                    self.flush_in_a_mood(daemon, *mood)
-            # Each mood: start and message; then, in peace where there is a lab, the second start and the stop.
+            for failure in self.FAILURES:
+                with self.subTest(failure[0]):
+                    self.flush_at_a_failure(daemon, *failure)
+            # Each row: start and message; then the second start and the stop, which succeed if the lab is the collector.
             counts = {"event posted": 4 * 2 + 10 * 2, "event lost: the server answered 5xx": 4,
                       "event lost: the server answered 4xx": 2,
                       "event lost: the server answered 3xx, and no post follows a redirect": 2,
                       "event lost: the post failed": 2 * 2 + 2 * 4, "event held: batched": 12 * 4}
             wait_until(lambda: counts.items() <= self.stats().items(), counts)
-        # One line a second at most; with the last, at the stop, every post that failed has been said.
+        # At most one line a second; with the last one, at the stop, the lines account for every post that failed.
         lines = [line for line in daemon.text if line.startswith(POST_ERROR)]
         self.assertEqual(lines[0], POST_ERROR + "transfer closed with 2 bytes remaining to read")
         said = (re.search(r" \((\d+) posts since the last such line\)$", line) for line in lines)
@@ -367,8 +367,8 @@ class Moods(HTTPSTest):
 
 
 class ClosingCollector(http.server.BaseHTTPRequestHandler):
-    """Answers one post a connection with 200, does not say that it closes, and closes, as a server does that has waited
-    long enough."""
+    """Answers one post per connection with 200 and then closes it without notice, as a server does when a kept connection
+    has been idle for too long."""
     protocol_version = "HTTP/1.1"
     closed = threading.Semaphore(0)
 
@@ -381,7 +381,7 @@ class ClosingCollector(http.server.BaseHTTPRequestHandler):
         super().finish()
         self.connection.setblocking(False)
         with contextlib.suppress(ssl.SSLWantReadError):
-            self.connection.unwrap()  # the closing alert; the client's own is not waited for
+            self.connection.unwrap()  # sends the closing alert and does not wait for the client's
         self.connection.close()
         self.closed.release()
 

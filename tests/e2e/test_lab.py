@@ -1,4 +1,4 @@
-"""The lab alone: its collector's odd bodies, its page, what it refuses, how it reads uploads and datagrams."""
+"""The lab without a daemon: unusual bodies, its page, refusals, uploads and datagrams."""
 import base64
 import gzip
 import hashlib

@@ -1,4 +1,4 @@
-"""Log data from a client's array to the server, and the dashboard that hears of it."""
+"""Log data: the upload of a client's array and the message to the dashboard about it."""
 import json
 
 from harness import SystemTest, storebag, wait_until
@@ -14,7 +14,7 @@ class LogData(SystemTest):
         out, said = self.ctl("upload-log-data", "--client-type", "7", "--session-id", "9", str(path), status=status)
         return out and json.loads(out), said
 
-    def test_array_and_its_place(self):
+    def test_upload_and_the_place_that_is_reported(self):
         self.lab.put("quindle", storebag(backends=DASHBOARD))
         data = [{"log": "x" * (3 << 20), "at": {"$date": 1700000000.5}, "raw": {"$data": "AP8="}}, -7, [True, 1.5]]
         done = {"op": "uploadLogData", "uploaded": True, "error": None}
@@ -37,7 +37,7 @@ class LogData(SystemTest):
         wait_until(lambda: len(places()) >= 3, "three announcements")
         self.assertEqual(sorted(places()), [line["answer"] for line in (first, second, many)])
 
-    def test_nobody_takes_it(self):
+    def test_failed_uploads_and_wrong_files(self):
         with self.serving("Log data array upload failed"):
             self.assertIn("Nobody took", self.upload([1], status=1)[1])
         for data, problem in (("[1", "logs.json: not JSON"), ("{}", "expected an array, found an object")):
@@ -46,7 +46,7 @@ class LogData(SystemTest):
     def test_bounds(self):
         self.lab.put("quindle", storebag(backends=DASHBOARD))
         self.lab.put("ostvane", storebag(backends={"dashboard": {**DASHBOARD["dashboard"], "post_url": 7}}))
-        large = ["x" * (15 << 20)]  # three times this is charged; two of them are more than one user may have
+        large = ["x" * (15 << 20)]  # three times this is charged, and two of them exceed the budget of one user
         with self.serving("Post URL for log data array is nil", "Log data array upload failed"):
             first, _ = self.open()
             other, _ = self.open(6)

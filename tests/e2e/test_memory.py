@@ -1,5 +1,5 @@
-"""What one user makes the daemon keep, whatever is sent: all value types, sizes, depths and states, with and without
-consent, to collectors that hang, answer hugely or never."""
+"""The memory that one user can make the daemon keep: all value types, sizes, depths and states, with and without consent,
+with collectors that hang, send huge answers or never answer."""
 import concurrent.futures
 import pathlib
 import plistlib
@@ -15,7 +15,7 @@ LOG_DATA = "uploadLogData:completionHandler:"
 CLIENTS = 12
 VALUES = (
     lambda r: "x" * r.choice((1, 200, 900_000)),
-    lambda r: "\x01" * r.choice((20, 300_000)),
+    lambda r: "\x01" * r.choice((20, 900_000)),
     lambda r: "€\U0001f600" * r.choice((9, 60_000)),
     lambda r: b"\0" * r.choice((1, 900_000)),
     lambda r: [{}] * r.choice((1, 49_000)),
@@ -42,7 +42,7 @@ class Memory(SystemTest):
         return daemon.status("VmRSS") * 1024
 
     def at_rest(self, daemon):
-        """After the first post, and a while without a session."""
+        """Resident memory after the first post and some time without a session."""
         session, _ = self.open()
         session.send()
         self.lab.wait_for_events(1)
@@ -54,7 +54,7 @@ class Memory(SystemTest):
         return wait_until(settled, "memory at rest")
 
     def play(self, seed, end):
-        """One client after the other, each with messages as they come, until `end`."""
+        """Runs one client after the other until `end`, each with random messages."""
         r = random.Random(seed)
         while time.monotonic() < end:
             wire = Wire(self.root)
@@ -65,7 +65,7 @@ class Memory(SystemTest):
                 for _ in range(r.choice((1, 10, 40))):
                     self.say(wire, r)
             except (OSError, plistlib.InvalidFileException):
-                pass  # shut out, or held back for too long: both are the daemon's right
+                pass  # refused, or made to wait too long; the daemon may do both
             finally:
                 wire.close()
 
@@ -81,16 +81,16 @@ class Memory(SystemTest):
                 wire.call("fetchStatesWithUserInfo:completionHandler:",
                           userInfo={"clientName": "phone", "serviceName": "ringer", "more": r.choice(VALUES)(r)})
             elif what < 0.15:
-                wire.raw(b"\0\x0f\xff\xff\2\0\0\0\0\0\0\1" + b"h" * r.choice((9, 900_000)))  # and no more
+                wire.raw(b"\0\x0f\xff\xff\2\0\0\0\0\0\0\1" + b"h" * r.choice((9, 900_000)))  # an unfinished frame
                 raise OSError
             else:
                 wire.send(Wire.CALL, {"op": SEND, "args": {"category": r.choice((5, 6)), "type": 1,
                                                            "payload": message(r)}})
         except (plistlib.InvalidFileException, OverflowError, TypeError, ValueError):
-            pass  # a value that this writer cannot write
+            pass  # plistlib cannot write this value
 
     def test_a_crowd_that_comes_and_goes(self):
-        """Within a second, each client of an identity of its own."""
+        """All within a second, each client with its own identity."""
         with self.serving("", env={"VELTRA_LOG": "error"}, serving=False) as daemon:
             wait_until(lambda: pathlib.Path(self.root.socket).exists(), "the socket")
             rest = self.at_rest(daemon)

@@ -1,4 +1,4 @@
-"""The HTTPS post back end at its borders: consent, server errors, addresses, batches without end, internal builds."""
+"""Edge cases of the HTTPS back end: consent, server errors, addresses, internal builds."""
 from harness import DEVICE
 from test_https import HTTPSTest, entry
 
@@ -21,7 +21,7 @@ class Posts(HTTPSTest):
                         self.assertEqual(client.message() is not None, answered)
                         client.close()
 
-    def test_borders_of_a_server_error(self):
+    def test_which_statuses_are_server_errors(self):
         self.serve(entry())
         with self.serving():
             client = self.client(batchEvent=True)
@@ -30,7 +30,7 @@ class Posts(HTTPSTest):
                 client.message()
                 self.lab.control(path="/events", status=status)
                 self.assertEqual(client.flush()[1], code)
-                # Only a changed identity has the states computed anew.
+                # The states are computed again only when the identity changes.
                 for service, reports in (("phone", code is None), ("bell", True), ("phone", True)):
                     self.assertEqual(client.states(clientName="phone", serviceName=service), ["httppost"] * reports)
             self.lab.reset()

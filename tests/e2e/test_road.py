@@ -1,4 +1,4 @@
-"""From a client's message to the collector."""
+"""The path of a message from a client to the collector, and the commands of veltractl."""
 import json
 import subprocess
 import time
@@ -47,7 +47,7 @@ class Road(SystemTest):
         self.assertEqual(sum(log.read_text().count("[httppost -> sendMessageWithDictionary]") for log in logs), 3)
 
     def test_examples(self):
-        """The clients in C and in Python do what they say."""
+        """The example clients in C and Python work."""
         with self.serving("user info provided without requiring it"):
             for number, command in enumerate(([program("hello")], ["python3", str(SOURCE / "examples/hello.py")]), 1):
                 done = subprocess.run(command, env=self.root.environment(), capture_output=True, timeout=30)
@@ -80,7 +80,7 @@ class Ctl(SystemTest):
 
     def test_copies_between_answers(self):
         send = '{"op":"send","category":5,"type":2,"payload":{"text":"a\\nb"}}\n'
-        with self.serving("Failed to get remote object proxy: "):  # for the copies of the session's end
+        with self.serving("Failed to get remote object proxy: "):  # for copies at the end of the session
             out, _ = self.ctl("session", "--client-type", "7", "--session-id", "9", *IDENTITY, "--aggregate",
                               input=send * 20 + '{"op":"finish"}\n')
         printed = [json.loads(line) for line in out.splitlines()]
@@ -102,7 +102,7 @@ class Ctl(SystemTest):
             daemon.wait_for_line("was invalidated", 3)
 
     def test_one_shot(self):
-        """One message and nothing around it; a call that the daemon does not answer ends at once."""
+        """One message without a session; a call that the daemon does not answer ends immediately."""
         def one_shot(*options, status=0):
             out, said = self.ctl("one-shot", *options, "--category", "9", "--type", "4", "codec=opus", status=status)
             return json.loads(out), said
@@ -133,6 +133,6 @@ class Ctl(SystemTest):
             path = self.root.path / "run/veltrad/counters.json"
             wait_until(lambda: path.exists() and reason in self.ctl("stats")[0], "a counted drop")
             self.assertEqual(json.loads(self.ctl("stats", "--json")[0])["counts"][reason], 1)
-        # The session's own stop message is not missed.
+        # The session's own stop message is counted too.
         self.assertEqual(self.counts()[reason], 1)
         self.assertIn("not running", self.ctl("stats", status=1)[1])

@@ -1,4 +1,4 @@
-"""One session of several back ends: what a message must hold, which answer counts, when a flush is answered."""
+"""A session with several back ends: required parts of a message, which answer is used, when a flush is answered."""
 import json
 
 from harness import DEVICE, storebag
@@ -9,12 +9,12 @@ SEND = "sendMessageWithDictionary:reply:"
 
 class Sessions(HTTPSTest):
     def serve_two(self, **more):
-        """Back ends that post to paths of their own."""
+        """Back ends that each post to a path of their own."""
         posting = {"httppost": {"clients": [entry(post_url="${url}/events/one")]},
                    "httppost2": {"clients": [entry(post_url="${url}/events/two")], "display_url": ""}}
         self.lab.put("quindle", storebag(backends={**posting, **more}))
 
-    def test_what_a_message_must_hold(self):
+    def test_required_parts_of_a_message(self):
         self.serve_two()
         cases = [({"type": 1}, None), ({"category": 1}, None), ({"category": "5", "type": 1}, None),
                  ({"category": 65541, "type": -1}, (5, 65535)),
@@ -32,17 +32,17 @@ class Sessions(HTTPSTest):
         with self.serving():
             client = self.client(batchEvent=True)
             self.assertEqual(client.backends, ["dashboard", "httppost", "httppost2"])
-            self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "")  # of the first that has one
+            self.assertEqual(client.ask("fetchDisplayURL:")["reply"], "")  # the first back end's that has one
             client.message(number=1)
             self.lab.control(path="/events/one", stall=True)
             self.lab.control(path="/events/two", status=503)
             reply, code, _ = client.flush()
             self.assertEqual((json.loads(reply)["events"][-1]["number"], code), (1, 503))
             self.lab.reset()
-            client.ask("fetchDisplayURL:")  # no second answer came before this one's
+            client.ask("fetchDisplayURL:")  # no second answer to the flush came before this one
             client.close()
 
-    def test_without_back_ends_everything_fails_politely(self):
+    def test_without_back_ends_every_call_is_answered(self):
         self.lab.put("ostvane", storebag(backends={"carrierpigeon": {}}))
         with self.serving("VeltraBackend(newBackendWithName)", "Could not find storebag name for client type 2"):
             none, empty = self.client(client_type=2), self.client(client_type=6)

@@ -1,5 +1,5 @@
-"""A shortage that passes, and what the process brings from whoever started it: the daemon as it ships, with its sandbox,
-with few descriptors, closed standard descriptors, a foreign environment."""
+"""Temporary shortages of descriptors and threads, and the environment in which the daemon is started: closed standard
+descriptors, hostile variables. The daemon runs with its sandbox."""
 import contextlib
 import os
 import resource
@@ -13,7 +13,7 @@ NOBODY = 65534
 
 class Shortage(SystemTest):
     def limit(self, daemon, more=None):
-        """So many descriptors from the lowest free one on; nothing: as many as at the start."""
+        """Allows `more` descriptors from the lowest free one on; None restores the original limit."""
         pid = daemon.popen.pid
         hard = resource.prlimit(pid, resource.RLIMIT_NOFILE)[1]
         used = {int(number) for number in os.listdir(f"/proc/{pid}/fd")}
@@ -21,10 +21,10 @@ class Shortage(SystemTest):
         resource.prlimit(pid, resource.RLIMIT_NOFILE, (hard if more is None else free + more, hard))
 
     def connect(self):
-        """A client, and what it is told where it gets no connection."""
+        """Connects a client; returns it and the refusal, if there is one."""
         client = Wire(self.root, hello=False)
         self.addCleanup(client.close)
-        with contextlib.suppress(ConnectionError):  # refused already
+        with contextlib.suppress(ConnectionError):  # already refused
             client.send(Wire.HELLO, {"wire": 1, "library": "8.0"})
         kind, _, body = client.frame()
         return client, body["error"]["description"] if kind == Wire.REFUSAL else None
@@ -34,14 +34,14 @@ class Shortage(SystemTest):
         client.close()
         return told
 
-    def test_a_full_table_is_told_and_passes(self):
+    def test_a_full_descriptor_table_refuses_clients_until_there_is_room(self):
         with self.serving("A connection could not be accepted", wrapper=("prlimit", "--nofile=40:40")) as daemon:
             clients = []
             while not clients or clients[-1][1] is None:
                 clients.append(self.connect())
                 self.assertLess(len(clients), 40)
 
-            def none_left():  # those of who was refused may go only now
+            def none_left():  # descriptors of refused clients may be closed only now
                 self.limit(daemon, 0)
                 return "the daemon has no descriptor left" in (self.refusal() or "")
             wait_until(none_left, "the spare descriptor's answer")
@@ -50,8 +50,8 @@ class Shortage(SystemTest):
                 client.close()
             wait_until(lambda: self.refusal() is None, "a client that is served again")
 
-    def test_what_could_not_be_read_is_read_again(self):
-        """Preferences, device properties, deployment, environment, key: none of it was ever read before."""
+    def test_files_are_read_again_after_a_shortage(self):
+        """Preferences, device properties, deployment, environment and key, none of which was read before."""
         with self.serving("the device's identifiers") as daemon:
             client = Wire(self.root)
             client.describe()
@@ -66,10 +66,10 @@ class Shortage(SystemTest):
             self.assertEqual(event["_build"], DEVICE["BuildVersion"])
             client.close()
 
-    def test_a_thread_that_cannot_be_had(self):
-        """The connection is there; the HTTP thread of the first request is not."""
+    def test_a_thread_that_cannot_be_started(self):
+        """The connection exists, but the HTTP thread for the first request cannot be started."""
         options = {}
-        if os.getuid() == 0:  # whom no limit of threads binds
+        if os.getuid() == 0:  # the limit of threads does not apply to root
             for path in (self.root.path, *self.root.path.rglob("*")):
                 os.chown(path, NOBODY, NOBODY)
             options = {"user": NOBODY, "group": NOBODY, "extra_groups": []}
@@ -77,13 +77,13 @@ class Shortage(SystemTest):
             first, second = Wire(self.root), Wire(self.root)
             first.describe(6), second.describe(7)
             for number, client, backends in ((1, first, None), (1000, second, ["httppost"])):
-                # By the daemon's own user: another one may lack the right.
+                # As the daemon's own user, because others may lack the right.
                 subprocess.run(["prlimit", f"--pid={daemon.popen.pid}", f"--nproc={number}:"], check=True, **options)
                 self.assertEqual(client.call(START)["results"].get("backends"), backends)
             first.close(), second.close()
 
     def test_entitlements_during_a_shortage(self):
-        """However far a connection gets, the next one finds the rules as they are."""
+        """However far a connection gets during the shortage, the next one finds the current rules."""
         with self.serving("A connection could not be accepted", "Entitlements could not be read just now") as daemon:
             self.assertIsNone(self.refusal())
             for more in range(7):
@@ -94,7 +94,7 @@ class Shortage(SystemTest):
                     self.limit(daemon)
                     self.assertIsNone(self.refusal())
 
-    def test_a_stop_ends_only_its_own_socket(self):
+    def test_a_stop_removes_only_its_own_socket(self):
         for put in (lambda path: open(path, "w").close(), lambda path: os.symlink("x", path)):
             with self.serving():
                 os.unlink(self.root.socket)
@@ -116,8 +116,8 @@ class Start(SystemTest):
         daemon.terminate()
         self.assertEqual(daemon.wait(DEADLINE), 0)
 
-    def test_a_foreign_environment(self):
-        """OpenSSL would refuse every server, and its keys would stand in the daemon's own log directory."""
+    def test_a_hostile_environment(self):
+        """With it, OpenSSL would refuse every server and write its keys to the daemon's log directory."""
         configuration = self.root.path / "etc/openssl.cnf"
         configuration.write_text("openssl_conf = a\n[a]\nssl_conf = b\n[b]\nsystem_default = c\n[c]\n"
                                  "MaxProtocol = TLSv1.1\n")
@@ -139,7 +139,7 @@ class Start(SystemTest):
         self.assertFalse((self.root.path / "run").exists())
 
     def test_a_key_that_comes_later(self):
-        """Its directory is missing at the start, and cannot be made where a file stands in the way."""
+        """Its directory is missing at start; it cannot be created if a file is in its place."""
         for in_the_way in (False, True):
             with self.subTest(in_the_way=in_the_way):
                 shutil.rmtree(self.root.path / "usr")

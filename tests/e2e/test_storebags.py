@@ -1,4 +1,4 @@
-"""What the daemon makes of storebags, good and bad, and of their servers."""
+"""Valid and invalid storebags, and servers that fail."""
 import time
 
 from harness import SystemTest, closed_port, storebag
@@ -28,7 +28,7 @@ class Conditional(SystemTest):
             third = self.lab.received("storebags", 3)[2]
             self.assertEqual(third["outcome"], "200")
             self.assertEqual(third["headers"]["If-Modified-Since"], second["headers"]["If-Modified-Since"])
-            # Not modified, but without the date: a failure, and the section stays.
+            # "Not modified" without the date is a failure, and the section stays in use.
             self.lab.control(path="/storebags", lastModified=False)
             daemon.allow("fetchStorebagWithName: Signature is missing", "propertyListWithData error", FAILED, SECTION)
             self.assertEqual(self.open()[1], ["httppost"])
@@ -41,11 +41,11 @@ class Conditional(SystemTest):
 
 class Servers(SystemTest):
     def test_quindle_has_a_default_and_other_names_get_nothing(self):
-        """Each row: the server's address, what the lab does, how many requests come."""
+        """Each row: the server's address, how the lab misbehaves, how many requests arrive."""
         for url, cut, came in ((f"https://localhost:{closed_port()}/bags", False, 0),
                                ("https://no-such-host.invalid/bags", False, 0),
                                (self.lab.url.replace("https", "http"), False, 0), (self.lab.url, True, 2),
-                               (self.lab.url, False, 0)):  # which nobody vouches for any more
+                               (self.lab.url, False, 0)):  # whose certificate is no longer trusted
             with self.subTest(url=url, cut=cut), self.serving(FAILED, SECTION, "mivo", "Mivo") as daemon:
                 before = len(self.lab.received("storebags"))
                 self.root.prefer(veltra_storebag_url=url)

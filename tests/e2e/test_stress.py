@@ -1,4 +1,4 @@
-"""Hundreds of sessions of few identities at once, by clients that are killed, for VELTRA_STRESS_SECONDS."""
+"""Runs hundreds of sessions with few identities, in client processes that are killed, for VELTRA_STRESS_SECONDS."""
 import os
 import pathlib
 import random
@@ -11,13 +11,13 @@ from harness import BUILD, Root, Wire, wait_until
 from test_https import HTTPSTest, entry
 
 SECONDS = float(os.environ.get("VELTRA_STRESS_SECONDS", "3"))
-CLIENTS, SESSIONS = 4, 60  # processes, and what each holds open at most
+CLIENTS, SESSIONS = 4, 60  # processes, and the most sessions that each holds open
 LEVELS = {7: "quindle", 6: "ostvane", 8: "brevatto"}
 PEOPLE = ("alpha", "Alpha", "beta", "gamma")
 
 
 class Crowd:
-    """One client process: does what comes to its mind with its sessions, and expects an answer to every call."""
+    """A client process that runs random operations on its sessions and expects an answer to every call."""
 
     def __init__(self, root_path, seed):
         self.root = Root.__new__(Root)
@@ -45,7 +45,7 @@ class Crowd:
     def message(self):
         return {"category": 5, "type": self.random.randrange(2, 9), "payload": {"text": "x" * self.random.randrange(900)}}
 
-    def pour(self, wire):
+    def send_many(self, wire):
         for _ in range(50):
             wire.send(Wire.CALL, {"op": "sendMessageWithDictionary:reply:", "args": {"message": self.message()}})
 
@@ -63,29 +63,29 @@ class Crowd:
         wire.close()
 
     def go_on(self):
-        deeds = (*[self.call] * 5, self.pour, self.leave)
+        operations = (*[self.call] * 5, self.send_many, self.leave)
         while True:
             joins = len(self.sessions) < 2 or (len(self.sessions) < SESSIONS and self.random.random() < 0.3)
-            (self.join if joins else self.random.choice(deeds))(self.random.choice(self.sessions or [None]))
+            (self.join if joins else self.random.choice(operations))(self.random.choice(self.sessions or [None]))
 
 
 class Stress(HTTPSTest):
-    lab_arguments = ("--max-age", "0")  # every start asks the storebag server
+    lab_arguments = ("--max-age", "0")  # every start of a session requests the storebag
 
     def start(self, seed):
         return subprocess.Popen([sys.executable, __file__, str(self.root.path), str(seed)], stderr=subprocess.PIPE)
 
     def left_over(self, daemon):
-        """How many descriptors, but for connections that are kept, and threads."""
+        """The numbers of descriptors, without kept connections, and of threads."""
         own = [name for name in daemon.descriptors() if not name.startswith("socket:")]
         return len(own), daemon.status("Threads")
 
-    def test_crowds_come_and_are_killed(self):
+    def test_killed_clients_leave_nothing_behind(self):
         for level, (kind, name) in enumerate(LEVELS.items()):
             self.serve(entry("alpha,beta,gamma", hierarchy=level), name=name)
         allowed = "sendMessageWithDictionary: Failed to get remote object proxy: The client "
         with self.serving(allowed, env={"VELTRA_LOG": "info"}) as daemon:
-            self.open()[0].close()  # so that what is made once is there
+            self.open()[0].close()  # so that everything that is created once exists
             before, memory = self.left_over(daemon), daemon.status("VmRSS")
             seeds = iter(range(1 << 30))
             clients = [self.start(next(seeds)) for _ in range(CLIENTS)]

@@ -1,4 +1,4 @@
-"""Files from a client to the upload server: what is uploaded, what the answer means, and what becomes of the file."""
+"""File uploads: what is sent, what the server's answer means, and whether the file is removed."""
 import hashlib
 import json
 import os
@@ -37,7 +37,7 @@ class Uploads(SystemTest):
         return json.loads(out), said
 
     def lend(self, wire, descriptor, path="/x/lent.log"):
-        """The frames that answer an upload with this descriptor (none: -1), an event before the reply."""
+        """Uploads this descriptor (-1: none) and returns the frames of the answer: an event, if any, and the reply."""
         self.call = getattr(self, "call", 1000) + 1
         lent = [descriptor] if descriptor >= 0 else []
         wire.send(Wire.CALL, {"op": OP, "args": {"path": path}}, self.call, len(lent), lent)
@@ -47,11 +47,11 @@ class Uploads(SystemTest):
         return frames
 
     def fates(self):
-        """What the run that has ended counted of files."""
+        """The counters about files of the daemon that has ended."""
         return {key: count for key, count in self.counts().items() if key.startswith("file ")}
 
-    def test_request_and_its_file(self):
-        content = os.urandom(1 << 20)  # too much to stay in memory
+    def test_the_request_and_the_file(self):
+        content = os.urandom(1 << 20)  # too large to stay in memory
         names = ["a b.log", "50%&x=1#ü.txt", b"\xff.log", "-"]
         with self.serving() as daemon:
             for name in names:
@@ -101,7 +101,7 @@ class Uploads(SystemTest):
         self.assertEqual(self.lab.received("uploads"), [])
 
     def test_descriptors_of_a_bare_client(self):
-        """The path is a name and nothing more; what came is closed, whatever it was."""
+        """The path is used only as a name, and every descriptor is closed, whatever it is."""
         path = self.make(content=b"lent")
         secret = self.make("secret", b"of the daemon")
         ends = os.pipe()
@@ -120,7 +120,7 @@ class Uploads(SystemTest):
                 with self.subTest(name):
                     (_, _, reply), = self.lend(client, descriptor)
                     self.assertEqual(reply, {"results": {"uploaded": False}})
-            client.send(Wire.CALL, {"op": OP, "args": {"path": "/y/silent"}}, 0, 1, [good])  # asks for no reply
+            client.send(Wire.CALL, {"op": OP, "args": {"path": "/y/silent"}}, 0, 1, [good])  # without a reply
             self.assertEqual([frame[0] for frame in self.lend(client, good)], [Wire.EVENT, Wire.REPLY])
             wait_until(lambda: len(daemon.descriptors()) <= len(before), f"descriptors back to {before}")
             daemon.wait_for_line(REGULAR, 5)
@@ -188,14 +188,14 @@ class Uploads(SystemTest):
         self.assertEqual(self.fates(), {"file lost: the daemon is stopping": 4})
 
     def test_memory_and_room(self):
-        """A large file that does not compress costs no memory; what it costs of the disk goes with it."""
+        """A large file that does not compress uses no memory, and its disk space is free again after the upload."""
         path = self.make("noise", os.urandom(64 << 20))
         scratch = self.root.path / "var/lib/veltrad/preferences"
         with self.serving("No room for the compressed bytes", "File upload failed") as daemon:
             self.upload(self.make("first"))
             before, files = daemon.status("VmRSS"), os.listdir(scratch)
             self.upload(path)
-            if BUILD.name not in ("asan", "tsan"):  # a sanitizer keeps memory of its own
+            if BUILD.name not in ("asan", "tsan"):  # a sanitizer keeps memory itself
                 self.assertLess(daemon.status("VmHWM"), before + (8 << 10))
             resource.prlimit(daemon.popen.pid, resource.RLIMIT_FSIZE, (1 << 20,) * 2)
             path = self.make("noise", os.urandom(2 << 20))
@@ -207,7 +207,7 @@ class Uploads(SystemTest):
                                         "file lost: no room for its compressed bytes": 1})
 
     def test_files_that_are_swapped(self):
-        """Somebody exchanges the path's file with another one all the while: only what was uploaded ever goes."""
+        """Another process keeps exchanging the file at the path. Only files that were uploaded are removed."""
         path, spare = os.fsdecode(self.files / "log"), os.fsdecode(self.files / "spare")
         swapper = subprocess.Popen([sys.executable, "-c", "import ctypes, sys; a, b = map(str.encode, sys.argv[1:]); "
                                     "libc = ctypes.CDLL(None)\nwhile True: libc.renameat2(-100, a, -100, b, 2)", path, spare])
@@ -230,14 +230,14 @@ class Uploads(SystemTest):
                     removed += gone
                     self.assertTrue(digest == uploaded or not gone, f"round {number}: the other file is gone")
                     os.close(descriptor)
-                while left := list(self.files.iterdir()):  # the swapper moves them meanwhile
+                while left := list(self.files.iterdir()):  # the swapper moves them in the meantime
                     left[0].unlink(missing_ok=True)
             self.assertEqual(session.descriptors(), before)
         self.assertGreater(removed, 0)
 
     @unittest.skipUnless(os.getuid() == 0 and os.path.exists("/dev/fuse"), "needs the right to mount")
-    def test_files_that_others_serve(self):
-        """The daemon asks nobody's file server; the library lends a copy. One's own mount namespace is no matter."""
+    def test_files_on_file_servers(self):
+        """The daemon reads from no file server; the library lends a copy. Files in the client's own mount namespace work."""
         place = self.root.path / "served"
         place.mkdir()
         served = Served(place, {"hangs": b"never read", "small": b"served", "large": bytes(9 << 20)})

@@ -1,4 +1,4 @@
-"""Hostile bytes on the socket: they cost their sender its connection and nobody else anything."""
+"""Hostile bytes on the socket, which must end only the connection of their sender."""
 import contextlib
 import plistlib
 import random
@@ -20,7 +20,7 @@ class Hostile(SystemTest):
         self.witness, self.sent = self.started(), 0
 
     def tearDown(self):
-        """The same process, the same session, each message once at the collector, in order."""
+        """Checks that process and session are the same as before and that each message arrived once and in order."""
         self.unharmed()
         self.lab.wait_for_events(self.sent, _method=5)
         self.assertEqual([e["n"] for e in self.lab.events() if e["_method"] == 5], list(range(1, self.sent + 1)))
@@ -48,7 +48,7 @@ class Hostile(SystemTest):
                     data[rng.randrange(12, len(data))] = rng.randrange(256)
             else:
                 data[5] = 1
-                data, passed = data[:rng.randrange(1, len(data))], [client.socket.fileno()]  # holds its own end
+                data, passed = data[:rng.randrange(1, len(data))], [client.socket.fileno()]  # its own connection
             with contextlib.suppress(BrokenPipeError, ConnectionResetError):
                 client.raw(bytes(data), passed)
             client.close()
@@ -58,7 +58,7 @@ class Hostile(SystemTest):
         wait_until(lambda: len(self.process.descriptors()) <= len(before), f"descriptors back to {before}")
 
     def test_client_that_does_not_read(self):
-        """It is no longer read from; what waits for it is bounded, and goes with it."""
+        """The daemon stops reading from it. What waits for it is bounded and is freed when it is gone."""
         client = Wire(self.root)
         client.socket.settimeout(1)
         body = plistlib.dumps({"op": "fetchDisplayURL:", "args": {}}, fmt=plistlib.FMT_BINARY)

@@ -41,7 +41,7 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
   std::vector<std::string> expected(cases.size() + 1, "interrupted");
   expected.push_back("sendMessage 7 2 none");
   EXPECT_EQ(door.journal.lines(), expected);
-  EXPECT_EQ(door.counters.value("call refused: it cannot be read"), cases.size() + 1);
+  EXPECT_EQ(door.counters.value(wire::Reason::call_unreadable), cases.size() + 1);
 }
 
 TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
@@ -87,7 +87,7 @@ TEST(Replies, MayOutliveTheConnection) {
   EXPECT_TRUE(client.atEnd());
   EXPECT_EQ(door.stop(), 0u);
   late("nobody is there");
-  EXPECT_EQ(door.counters.value("reply dropped: the client has gone"), 1u);
+  EXPECT_EQ(door.counters.value(wire::Reason::reply_client_gone), 1u);
   late = nullptr;  // before the counters go
 }
 

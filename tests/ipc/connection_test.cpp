@@ -56,7 +56,7 @@ TEST(Connection, EndsWhenTheClientBreaksTheProtocolAndSaysHow) {
     EXPECT_THAT(refusalOf(client), HasSubstr(why));
   }
   ASSERT_TRUE(door.journal.waitForLines(2 * cases.size()));
-  EXPECT_EQ(door.counters.value("connection ended: the client broke the protocol"), cases.size());
+  EXPECT_EQ(door.counters.value(wire::Reason::protocol_broken), cases.size());
 }
 
 TEST(Connection, TakesADescriptorWithItsFrameAndKeepsNone) {
@@ -115,7 +115,7 @@ TEST(Replies, FromElsewhereThatNobodyReadsEndTheConnection) {
   ASSERT_TRUE(door.journal.waitFor("all held"));
   for (const wire::StringReply& reply : held) reply(std::string(10'000, 'x'));
   ASSERT_TRUE(door.journal.waitFor("end"));
-  EXPECT_GE(door.counters.value("connection ended: the client does not read its replies"), 1u);
+  EXPECT_GE(door.counters.value(wire::Reason::replies_unread), 1u);
   held.clear();  // before the counters go
 }
 
@@ -157,7 +157,7 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
   WireEnd third = door.stranger();
   EXPECT_EQ(refusalOf(third), "Connection refused: uid " + std::to_string(::getuid()) +
                                   " has 2 connections open, and no more are taken of one user.");
-  EXPECT_EQ(door.counters.value("connection refused: too many connections of one user"), 1u);
+  EXPECT_EQ(door.counters.value(wire::Reason::too_many_of_user), 1u);
   first.close();
   ASSERT_TRUE(door.journal.waitFor("end"));
   // The place is free as soon as the thread has ended; until then the refusal is right.
@@ -206,7 +206,7 @@ TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
     ASSERT_TRUE(door.journal.waitForLines(9 * (round + 1)));
   }
   EXPECT_EQ(door.journal.lines().size(), 27u) << "the boasting client was ended";
-  EXPECT_EQ(door.counters.value("connection ended: too many bytes of unfinished frames"), 3u);
+  EXPECT_EQ(door.counters.value(wire::Reason::unfinished_frames), 3u);
 }
 
 }  // namespace

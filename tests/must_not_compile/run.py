@@ -1,5 +1,5 @@
-"""Compiles each file as it is, which must work, and with its fault, which must fail for the reason given. A lock without a
-rank for the compiler would compile in any order, so there is none."""
+"""Compiles each file unchanged, which must succeed, and with a fault, which must fail with the given error. Also checks that
+every lock has a rank, because the compiler would accept a lock without one in any order."""
 import re
 import subprocess
 import sys
@@ -10,7 +10,7 @@ SOURCES = HERE.parent.parent / "src"
 ROOMS = HERE.parent.parent / "build" / "dev" / "rooms"
 LOCKS = ["-I", str(SOURCES), "-Wthread-safety", "-Wthread-safety-beta", "-Werror"]
 CONFIG = [word for room in ("config", "support", "wire", "platform", "base") for word in ("-I", str(ROOMS / room))]
-# Each: the file, what it is compiled with, and what must stand in the error; None: it must compile.
+# File, compiler flags, and the text that the error must contain; None: it must compile.
 CASES = [
     ("lock_order.cpp", LOCKS, None),
     ("lock_order.cpp", [*LOCKS, "-DWRONG_ORDER=1"], "must be acquired before"),

@@ -97,7 +97,7 @@ TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) 
   for (const auto& put : inItsPlace) {
     put();
     write("lost");
-    EXPECT_EQ(_counters.value("log line lost: the disk did not take it"), ++lost);
+    EXPECT_EQ(_counters.value(wire::Reason::log_line_disk), ++lost);
     ::setrlimit(RLIMIT_FSIZE, &before);
     ASSERT_THAT(_place.names(), ElementsAre("elsewhere"));
     _log.expectLine(Level::info, "writeToLogFile: Deleted expired veltrad log file " + _current + " (20");
@@ -122,11 +122,12 @@ TEST_F(MessageLogTest, AClockThatJumpsLeavesOneFile) {
 
 TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
   platform::DiskWriter::Queue other(_writer, 1);
-  std::latch stalled(1);
-  other.put([&] { stalled.wait(); }, 1);
+  std::latch begun(1), stalled(1);
+  other.put([&] { begun.count_down(), stalled.wait(); }, 1);
+  begun.wait();
   const std::string megabyte(1 << 20, 'x');
   for (int i = 0; i < 6; ++i) _messages.writeToLogFile("%@", megabyte);
-  EXPECT_EQ(_counters.value("log line dropped: 4 MiB of them wait for the disk"), 3u);
+  EXPECT_EQ(_counters.value(wire::Reason::log_line_queue_full), 3u);
   const std::string stamp = dateAt(_now);
   _clock.advance(60);  // a line has the time at which it was logged
   stalled.count_down();

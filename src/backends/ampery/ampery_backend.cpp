@@ -27,8 +27,7 @@ std::optional<std::string> AmperyBackend::sendMessage(const Dictionary* payload,
                                                       std::uint16_t method, std::uint16_t respCode,
                                                       std::uint16_t eventID, std::int32_t) {
   if (method == 0 || !payload || payload->empty()) {
-    _counters.count(method == 0 ? "message without energy event: its category is 0"
-                                : "message without energy event: its payload is empty");
+    _counters.count(method == 0 ? wire::Reason::energy_category_zero : wire::Reason::energy_payload_empty);
     return std::nullopt;
   }
   Dictionary event = *payload;

@@ -30,7 +30,7 @@ void EnergyLog::logRegisteredEvent(std::uint32_t client, const std::string& name
     failure = append(text);
     lostBefore = std::exchange(_lost, failure ? _lost + 1 : 0);
   }
-  _counters.count(failure ? "energy event lost: the energy log cannot be written" : "energy event written");
+  _counters.count(failure ? wire::Reason::energy_log_failed : wire::Reason::energy_written);
   if (failure && lostBefore == 0) {
     logError("logRegisteredEvent: The energy log cannot be written, events are lost: %s", failure->c_str());
   } else if (!failure && lostBefore > 0) {

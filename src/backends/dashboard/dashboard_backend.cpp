@@ -166,7 +166,7 @@ std::optional<std::string> DashboardBackend::sendMessage(const Dictionary* paylo
   packet.header = headerOf(timestamp, method, respCode, eventID);
   PacketText text(packet.text);
   if (payload) text.append(*payload);
-  if (text.cut()) _counters.count("datagram cut: its text is longer than 1023 bytes");
+  if (text.cut()) _counters.count(wire::Reason::datagram_cut);
   const std::size_t length = sizeof packet.header + text.length();
   packet.header.invertedLength = htobe16(static_cast<std::uint16_t>(~length));
 

@@ -29,24 +29,23 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
                                                   const Array& logData) {
   if (!postURL) {
     logError("DashboardBackend(uploadLogData): Post URL for log data array is nil");
-    _counters.count("log data lost: no address to post it to");
+    _counters.count(wire::Reason::log_data_no_address);
     return std::nullopt;
   }
   auto archive = archiveOf(logData);
   if (!archive) {
     logError("DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
-    _counters.count("log data lost: no memory for its archive");
+    _counters.count(wire::Reason::log_data_no_memory);
     return std::nullopt;
   }
   const auto body = post(*postURL, std::move(*archive));
   if (!body.ok() || body.value().empty()) {
     logError("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
              body.ok() ? "" : body.error().c_str());
-    _counters.count(body.ok() ? "log data lost: the server named no place"
-                              : "log data lost: the post failed");
+    _counters.count(body.ok() ? wire::Reason::log_data_no_place : wire::Reason::log_data_failed);
     return std::nullopt;
   }
-  _counters.count("log data uploaded");
+  _counters.count(wire::Reason::log_data_uploaded);
   std::string location = toUTF8(body.value());
   logDebug("DashboardBackend(uploadLogData): Log data uploaded to %s", location.c_str());
   return location;

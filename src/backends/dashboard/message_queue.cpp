@@ -24,18 +24,20 @@ MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send)
 
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                                                std::optional<platform::Charge> charge) {
-  First result;
-  result.sent = _send(datagram);
-  if (result.sent && !_reliableUDP) return result;
-  result.notKept = !charge;
-  if (!charge) return result;
+  const bool sent = _send(datagram);
+  First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt};
+  if (sent && !_reliableUDP) return result;
+  if (!charge)
+    return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt};
   auto& record = _pending.emplace_back(datagram, eventNumber, ++_lastSerial, std::move(*charge));
-  if (result.sent) {
+  if (sent) {
     record.setState(UDPPacketToSend::awaitsAcknowledgement);
     if (_copies) _copies->sent(record.serial(), eventNumber);
   }
-  result.pushedOut = _pending.size() > _most;
-  if (result.pushedOut) _pending.pop_front();
+  if (_pending.size() > _most) {
+    _pending.pop_front();
+    result.pushedOut = _copies ? wire::Reason::shared_datagrams_wait : wire::Reason::datagrams_wait;
+  }
   return result;
 }
 

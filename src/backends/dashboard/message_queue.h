@@ -12,6 +12,7 @@
 #include "backends/dashboard/sent_copies.h"
 #include "backends/dashboard/udp_packet_to_send.h"
 #include "platform/memory_budget.h"
+#include "wire/reasons.h"
 
 namespace veltrad::backends {
 
@@ -26,9 +27,8 @@ class MessageQueue {
   using Send = std::function<bool(std::string_view datagram)>;
 
   struct First {
-    bool sent = false;
-    bool notKept = false;    // it would wait, but nobody pays for its memory
-    bool pushedOut = false;  // the oldest made room
+    wire::Reason fate;                      // sent, held, or no memory to wait
+    std::optional<wire::Reason> pushedOut;  // of the oldest, which made room
   };
   struct Tick {
     std::size_t sent = 0;  // for the first time

@@ -13,7 +13,6 @@
 namespace veltrad::backends {
 
 namespace {
-constexpr std::string_view kLost = "datagram lost: its back end ended before it was sent";
 constexpr int kMostReadAtOnce = 64;  // then the pool's other handlers have their turn
 constexpr std::size_t kEventIDAt = offsetof(tagReportingPacketHeader, eventID);
 // What a datagram that waits keeps beside its bytes: the record, its place in the list, the copies that are
@@ -41,7 +40,7 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
 
 NetworkProcQueue::~NetworkProcQueue() {
   const Lock held(_mutex);
-  giveUp("datagram given up: not acknowledged before its back end ended");
+  giveUp(wire::Reason::ended_before_acknowledgement);
   _readSource.reset();  // before the socket that it watches
 }
 
@@ -56,20 +55,13 @@ void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eve
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
-    _counters.count(kLost);
+    _counters.count(wire::Reason::ended_before_sent);
     return;
   }
   const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
-  if (first.sent) _counters.count("datagram sent");
-  if (!first.sent && !first.notKept) _counters.count("datagram held: the socket did not take it");
-  if (first.notKept) {
-    _counters.count(first.sent ? "datagram given up: no memory to await its acknowledgement"
-                               : "datagram lost: the socket did not take it, and no memory to hold it");
-  }
-  if (first.pushedOut) {
-    _counters.count(_kind.shared ? "datagram dropped: 1024 later ones wait"
-                                 : "datagram dropped: 50 later ones wait");
-  }
+  if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
+  _counters.count(first.fate);
+  if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
 }
 
@@ -95,7 +87,7 @@ void NetworkProcQueue::cleanup() {
     if (--_backEnds > 0) return;
     if (_schedule.cleanup(!_messageQueue.empty()) == DeliverySchedule::Verdict::stop) return cleanupSources();
     if (!chargeSocket()) {
-      giveUp("datagram given up: no memory for its dashboard after its session");
+      giveUp(wire::Reason::no_memory_to_linger);
       return cleanupSources();
     }
   }
@@ -111,14 +103,14 @@ bool NetworkProcQueue::chargeSocket() {
 void NetworkProcQueue::end() {
   const Lock held(_mutex);
   if (_backEnds > 0 || !_timer) return;
-  giveUp("datagram given up: too many dashboards waited after their sessions");
+  giveUp(wire::Reason::too_many_linger);
   cleanupSources();
 }
 
 // `reason`: of those that went out.
-void NetworkProcQueue::giveUp(std::string_view reason) {
+void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();
-  _counters.count(kLost, notSent);
+  _counters.count(wire::Reason::ended_before_sent, notSent);
   _counters.count(reason, _messageQueue.size() - notSent);
   _messageQueue.clear();
 }
@@ -140,9 +132,9 @@ void NetworkProcQueue::timerFired() {
 
 void NetworkProcQueue::myPeriodicTask(DeliverySchedule::Time time) {
   const MessageQueue::Tick tick = _messageQueue.tick();
-  _counters.count("datagram sent", tick.sent);
-  _counters.count("datagram sent again: not acknowledged", tick.sentAgain);
-  _counters.count("datagram given up: never acknowledged", tick.givenUp);
+  _counters.count(wire::Reason::datagram_sent, tick.sent);
+  _counters.count(wire::Reason::datagram_sent_again, tick.sentAgain);
+  _counters.count(wire::Reason::never_acknowledged, tick.givenUp);
   switch (_schedule.afterTick(time, !_messageQueue.empty())) {
     case DeliverySchedule::Verdict::stop:
       logDebug("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
@@ -177,12 +169,12 @@ bool NetworkProcQueue::processSocketRead() {
   if (!length) return false;
   std::uint16_t eventNumber = 0;
   if (*length < kEventIDAt + sizeof eventNumber) {
-    _counters.count("acknowledgement ignored: shorter than 62 bytes");
+    _counters.count(wire::Reason::acknowledgement_short);
     return true;
   }
   std::memcpy(&eventNumber, datagram + kEventIDAt, sizeof eventNumber);
   const bool known = _messageQueue.acknowledge(be16toh(eventNumber));
-  _counters.count(known ? "datagram acknowledged" : "acknowledgement ignored: no such datagram waits");
+  _counters.count(known ? wire::Reason::datagram_acknowledged : wire::Reason::acknowledgement_unknown);
   return true;
 }
 

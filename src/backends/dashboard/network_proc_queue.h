@@ -69,7 +69,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False: there is no room for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);
-  void giveUp(std::string_view reason) REQUIRES(_mutex);
+  void giveUp(wire::Reason reason) REQUIRES(_mutex);
 
   // Constant after construction.
   platform::Counters& _counters;

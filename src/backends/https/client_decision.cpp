@@ -23,17 +23,17 @@ const Dictionary* countryEntry(const Dictionary& entry, const std::optional<std:
   return nullptr;
 }
 
-ClientRefusal refusalOfLists(const Dictionary& entry, const ClientFacts& facts) {
+std::optional<wire::Reason> refusalOfLists(const Dictionary& entry, const ClientFacts& facts) {
   if (!matchStringWithList(textsOf(entry.array("locale_whitelist")), facts.country, false)) {
-    return ClientRefusal::countryNotListed;
+    return wire::Reason::country_not_listed;
   }
   if (!matchStringWithList(textsOf(entry.array("device_whitelist")), facts.productFamily, true)) {
-    return ClientRefusal::deviceNotListed;
+    return wire::Reason::device_not_listed;
   }
   if (matchStringWithList(textsOf(entry.array("device_blacklist")), facts.hardwareType, false)) {
-    return ClientRefusal::deviceListed;
+    return wire::Reason::device_refused;
   }
-  return ClientRefusal::none;
+  return std::nullopt;
 }
 
 void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientVerdict& verdict) {
@@ -45,7 +45,7 @@ void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientV
     verdict.threshold = own->real("threshold");
   }
   if (!verdict.threshold) {
-    verdict.refusal = ClientRefusal::thresholdMissing;
+    verdict.reason = wire::Reason::no_threshold;
     return;
   }
   // A factor equal to the threshold is sampled in.
@@ -57,8 +57,9 @@ void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientV
   verdict.overrideSampling = entry.real("override_sampling");
   if (!verdict.overrideSampling || facts.samplingFactor <= *verdict.overrideSampling) {
     verdict.state = kBackendHeld;
+    verdict.reason = wire::Reason::held_by_sampling;
   } else {
-    verdict.refusal = ClientRefusal::sampledOut;
+    verdict.reason = wire::Reason::sampled_out;
   }
 }
 }  // namespace
@@ -71,40 +72,18 @@ ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts) 
   if (verdict.overrideDNU == 1) {
     verdict.dnuType = facts.consent ? 2 : 1;
   } else if (!facts.consent) {
-    verdict.refusal = ClientRefusal::consentMissing;
+    verdict.reason = wire::Reason::no_consent;
     return verdict;
   }
-  verdict.refusal = refusalOfLists(entry, facts);
-  if (verdict.refusal != ClientRefusal::none) return verdict;
+  verdict.reason = refusalOfLists(entry, facts);
+  if (verdict.reason) return verdict;
   verdict.filters = entry.array("filters");
   if (!verdict.filters) {
-    verdict.refusal = ClientRefusal::filtersMissing;
+    verdict.reason = wire::Reason::no_filters;
     return verdict;
   }
   decideOnSampling(entry, facts, verdict);
   return verdict;
-}
-
-const char* reasonOf(ClientRefusal refusal) {
-  switch (refusal) {
-    case ClientRefusal::none:
-      return "";
-    case ClientRefusal::consentMissing:
-      return "back end disabled: no consent to diagnostic submission";
-    case ClientRefusal::countryNotListed:
-      return "back end disabled: the country is not in locale_whitelist";
-    case ClientRefusal::deviceNotListed:
-      return "back end disabled: the device is not in device_whitelist";
-    case ClientRefusal::deviceListed:
-      return "back end disabled: the device is in device_blacklist";
-    case ClientRefusal::filtersMissing:
-      return "back end disabled: the client entry has no filters";
-    case ClientRefusal::thresholdMissing:
-      return "back end disabled: the client entry has no sampling threshold";
-    case ClientRefusal::sampledOut:
-      return "back end disabled: sampled out";
-  }
-  return "";
 }
 
 }  // namespace veltrad::backends

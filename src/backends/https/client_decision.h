@@ -7,6 +7,7 @@
 #include <string>
 
 #include "base/value.h"
+#include "wire/reasons.h"
 
 namespace veltrad::backends {
 
@@ -19,21 +20,10 @@ struct ClientFacts {
   double samplingFactor = 0;  // this back end's draw, in [0, 1)
 };
 
-enum class ClientRefusal {
-  none,
-  consentMissing,    // no consent, and the entry does not override it
-  countryNotListed,  // "locale_whitelist", which must not be empty
-  deviceNotListed,   // "device_whitelist"
-  deviceListed,      // "device_blacklist"
-  filtersMissing,    // "filters" is required
-  thresholdMissing,  // no "sampling_threshold", and no country's own
-  sampledOut,        // above the threshold and above "override_sampling"
-};
-
-// A refusal ends the decision at once: what later steps would have found is absent.
+// A reason to be disabled ends the decision at once: what later steps would have found is absent.
 struct ClientVerdict {
-  std::int32_t state = 1;  // BackendState: 1 disabled, 2 reporting, 3 held by sampling
-  ClientRefusal refusal = ClientRefusal::none;
+  std::int32_t state = 1;              // BackendState: 1 disabled, 2 reporting, 3 held by sampling
+  std::optional<wire::Reason> reason;  // unless it reports
   std::int32_t hierarchy = 0;
   std::int32_t overrideDNU = 0;  // the entry's own number; 1 overrides consent
   std::int32_t dnuType = 0;      // 0 consent respected; overridden: 1 without consent, 2 with it
@@ -50,8 +40,5 @@ struct ClientVerdict {
 };
 
 ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts);
-
-// The counter's text of a refusal.
-const char* reasonOf(ClientRefusal refusal);
 
 }  // namespace veltrad::backends

@@ -7,7 +7,7 @@ namespace veltrad::backends {
 
 HeldEvents::~HeldEvents() {
   const Lock held(_mutex);
-  _counters.count("event dropped: its back end ended before a flush", _batch.size());
+  _counters.count(wire::Reason::ended_before_flush, _batch.size());
 }
 
 bool HeldEvents::empty() const {
@@ -34,7 +34,7 @@ void HeldEvents::add(std::int32_t method, Dictionary event, const EventSize& siz
     _batch.add(method, std::move(event), size, turn);
     if (dropped > 0) settle();
   }
-  _counters.count("event dropped: the batch is full", dropped);
+  _counters.count(wire::Reason::batch_full, dropped);
 }
 
 void HeldEvents::restartCount(std::int32_t method) {
@@ -51,7 +51,7 @@ void HeldEvents::setSessionID(const std::string& sessionID) {
     _batch.setSessionID(sessionID);
     dropped = settle();
   }
-  _counters.count("event dropped: its user keeps too much", dropped);
+  _counters.count(wire::Reason::event_over_share, dropped);
 }
 
 HeldEvents::Taken HeldEvents::take() {
@@ -79,7 +79,7 @@ void HeldEvents::dropOldest() {
     _batch.dropOldest();
     settle();
   }
-  _counters.count("event dropped: its user keeps too much");
+  _counters.count(wire::Reason::event_over_share);
 }
 
 // The charge follows the batch; how many events had to go because it could not grow.

@@ -16,19 +16,19 @@ namespace veltrad::backends {
 namespace {
 constexpr std::uint16_t kSessionTypeStop = 1;
 
-const char* reasonOf(http::HTTPError::Kind kind) {
+wire::Reason reasonOf(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
     case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
-      return "event lost: the post failed";
+      return wire::Reason::post_failed;
     case http::HTTPError::Kind::tooMany:
-      return "event lost: too many posts under way";
+      return wire::Reason::too_many_posts;
     case http::HTTPError::Kind::shortage:
-      return "event lost: no descriptor, thread or memory for its post";
+      return wire::Reason::post_shortage;
     case http::HTTPError::Kind::stopping:
-      return "event lost: the daemon stopped before the post ended";
+      return wire::Reason::post_stopped;
   }
-  return "event lost: the post failed";
+  return wire::Reason::post_failed;
 }
 
 bool meansRealtime(std::int32_t flag) {
@@ -44,7 +44,7 @@ std::optional<std::string> HTTPSPostBackend::sendMessage(const Dictionary* paylo
                                                          std::uint16_t respCode, std::uint16_t eventID,
                                                          std::int32_t flag) {
   if (state() == kBackendDisabled) {
-    _services.counters.count("event dropped: the back end is disabled");
+    _services.counters.count(wire::Reason::backend_disabled);
     return std::nullopt;
   }
   Dictionary stopPayload;
@@ -127,8 +127,8 @@ void HTTPSPostBackend::prepareEventForMessage(Dictionary& event) const {
 
 void HTTPSPostBackend::filterEvent(Dictionary& event) const {
   const FilterTable::Outcome outcome = _filters.filterEvent(event);
-  if (outcome.removed > 0) _services.counters.count("event field removed: by a filter", outcome.removed);
-  if (outcome.hashed > 0) _services.counters.count("event field hashed: by a filter", outcome.hashed);
+  if (outcome.removed > 0) _services.counters.count(wire::Reason::field_removed, outcome.removed);
+  if (outcome.hashed > 0) _services.counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
 std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::uint64_t sessionIDChanges) {
@@ -149,26 +149,25 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, std::u
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  const bool kept = keep(std::move(event), size, method, sessionIDChanges);
-  _services.counters.count(kept ? "event held: batched" : "event dropped: its user keeps too much");
+  _services.counters.count(keep(std::move(event), size, method, sessionIDChanges));
   return flushed;
 }
 
-// False: there is no room for it, even without what the user's other batches hold.
-bool HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
-                            std::uint64_t sessionIDChanges) {
+// Batched, or there is no room for it, even without what the user's other batches hold.
+wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
+                                    std::uint64_t sessionIDChanges) {
   platform::MemoryAccount* account = memoryAccount().get();
   auto charge = account ? account->keep(size.charged) : platform::Charge();
-  if (!charge) return false;
+  if (!charge) return wire::Reason::event_over_share;
   if (account && !std::exchange(_evictable, true)) account->add(_held);
   _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
              sessionIDChanges);
-  return true;
+  return wire::Reason::event_batched;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (state() != kBackendReporting) {
-    _services.counters.count("event dropped: flushed while the back end does not report", _held->discard());
+    _services.counters.count(wire::Reason::flushed_unreported, _held->discard());
   }
   if (_held->empty()) {
     if (completion) completion(std::nullopt, wire::makeReportingError("Nothing to flush", -1));
@@ -215,7 +214,7 @@ void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {
 }
 
 void HTTPSPostBackend::restrict(Dictionary& event) const {
-  _services.counters.count("event field removed: JSON cannot carry it", restrictEventForJSON(event));
+  _services.counters.count(wire::Reason::field_not_json, restrictEventForJSON(event));
 }
 
 std::string HTTPSPostBackend::createMessageForPostAndLogging(std::vector<Dictionary> events,
@@ -246,7 +245,7 @@ void HTTPSPostBackend::postJSONMessage(std::string json, std::int32_t withFlag,
                                        FlushCompletion completion) {
   const auto& url = meansRealtime(withFlag) ? _realtimePostURL : _postURL;
   if (!url) {
-    _services.counters.count("event lost: postURL is nil", eventCount);
+    _services.counters.count(wire::Reason::post_url_nil, eventCount);
     if (completion) completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return;
   }

@@ -55,7 +55,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   void filterEvent(Dictionary& event) const;
   void restrict(Dictionary& event) const;
   std::optional<std::string> batchEvent(Dictionary event, std::uint64_t sessionIDChanges);
-  bool keep(Dictionary event, const EventSize& size, std::int32_t method, std::uint64_t sessionIDChanges);
+  wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
+                    std::uint64_t sessionIDChanges);
   std::optional<std::string> postEvent(Dictionary event, bool realtime, std::uint16_t method,
                                        std::uint16_t respCode, std::int32_t flag);
   // The compact JSON; `pretty` gets the readable copy where logging is allowed.

@@ -97,11 +97,11 @@ std::int32_t HTTPSPostBackend::updateBackendState() {
   if (entry) applyExpedite(*entry);
   if (!requireUserInfo()) return reportForEveryone(*clients);
   if (!userInfo) {
-    _services.counters.count("back end waiting: user info is required, and there is none");
+    _services.counters.count(wire::Reason::waits_for_user_info);
     return kBackendWaiting;
   }
   if (!entry) {
-    _services.counters.count("back end disabled: no client entry fits");
+    _services.counters.count(wire::Reason::no_entry);
     return kBackendDisabled;
   }
   return reportForClient(*entry, clientName, serviceName);
@@ -129,19 +129,17 @@ std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
   _dnuType = verdict.dnuType;
   if (verdict.filters) _filters.createFiltersFromArray(*verdict.filters);
   if (verdict.samplingReached) takeSampling(verdict, country);
-  if (verdict.refusal != ClientRefusal::none) {
+  if (verdict.reason) {
     logRefusal(entry, verdict, country);
-    _services.counters.count(reasonOf(verdict.refusal));
+    _services.counters.count(*verdict.reason);
   }
-  if (verdict.state == kBackendHeld)
-    _services.counters.count("back end held: sampled out, may be overridden");
   if (!verdict.samplingReached) return kBackendDisabled;
 
   resetBackendStateWithClient(&entry);
   if (entry.contains("custom_clientId")) {
     auto identifier = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
     if (!identifier) {  // another would be no better than a wrong one
-      _services.counters.count("back end disabled: its client's identifier cannot be read");
+      _services.counters.count(wire::Reason::no_identifier);
       return kBackendDisabled;
     }
     _uuidCustom = std::move(identifier);
@@ -161,28 +159,26 @@ void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& 
     const Value* list = entry.find(key);
     return list ? formats::writeJSON(*list) : std::string("(null)");
   };
-  switch (verdict.refusal) {
-    case ClientRefusal::consentMissing:
+  switch (*verdict.reason) {
+    case wire::Reason::no_consent:
       logDebug("HTTPSPostBackend(updateBackendState): reporting disabled by DNU: %d.", verdict.overrideDNU);
       break;
-    case ClientRefusal::countryNotListed:
+    case wire::Reason::country_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in country code list %s",
                country ? country->c_str() : "(null)", printed("locale_whitelist").c_str());
       break;
-    case ClientRefusal::deviceNotListed:
+    case wire::Reason::device_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
                productFamily().c_str(), printed("device_whitelist").c_str());
       break;
-    case ClientRefusal::deviceListed:
+    case wire::Reason::device_refused:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
                hardwareType() ? hardwareType()->c_str() : "(null)", printed("device_blacklist").c_str());
       break;
-    case ClientRefusal::filtersMissing:
+    case wire::Reason::no_filters:
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;
-    case ClientRefusal::none:
-    case ClientRefusal::thresholdMissing:
-    case ClientRefusal::sampledOut:
+    default:
       break;  // the line of the state says it
   }
 }

@@ -87,7 +87,9 @@ JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::v
   const Value envelope = Dictionary{
       {"clientId", clientID}, {"events", std::move(list)}, {"postTime", finiteOrMinusOne(postTime)}};
   JSONMessage message{formats::writeJSON(envelope), std::nullopt};
-  if (wantPretty) message.pretty = formats::writeJSON(envelope, formats::JSONStyle::pretty);
+  if (wantPretty)
+    message.pretty = formats::writeJSON(envelope, formats::JSONStyle::pretty,
+                                        message.compact.size() + message.compact.size() / 4);
   return message;
 }
 

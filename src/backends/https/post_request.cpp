@@ -56,15 +56,15 @@ http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url,
 PostVerdict verdictOfStatus(int status) {
   switch (status / 100) {
     case 2:
-      return {false, "event posted"};
+      return {false, wire::Reason::event_posted};
     case 3:
-      return {false, "event lost: the server answered 3xx, and no post follows a redirect"};
+      return {false, wire::Reason::server_redirected};
     case 4:
-      return {false, "event lost: the server answered 4xx"};
+      return {false, wire::Reason::server_refused};
     case 5:
-      return {true, "event lost: the server answered 5xx"};
+      return {true, wire::Reason::server_error};
     default:
-      return {false, "event lost: the server answered with an unknown status"};
+      return {false, wire::Reason::server_status_unknown};
   }
 }
 

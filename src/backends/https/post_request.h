@@ -6,6 +6,7 @@
 #include <string>
 
 #include "http/http_client.h"
+#include "wire/reasons.h"
 
 namespace veltrad::backends {
 
@@ -25,7 +26,7 @@ http::HTTPRequest makePostRequest(const VeltraBackend& backend, std::string url,
 // What an answer's status means for the backend and for the events of the post.
 struct PostVerdict {
   bool disablesBackend;  // 5xx
-  const char* reason;    // the counter's text
+  wire::Reason reason;   // of the events' fate
 };
 PostVerdict verdictOfStatus(int status);
 

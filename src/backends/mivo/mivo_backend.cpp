@@ -53,8 +53,7 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
-    _counters.count(_mivoAdaptor ? "message dropped: the adaptor does not take messages"
-                                 : "message dropped: there is no adaptor");
+    _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
     return std::nullopt;
   }
   const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, method, respCode, payload);
@@ -62,7 +61,7 @@ std::optional<std::string> MivoBackend::sendMessage(const Dictionary* payload, p
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
   }
-  _counters.count(thrown ? "message lost: the adaptor threw" : "message handed to the adaptor");
+  _counters.count(thrown ? wire::Reason::adaptor_threw : wire::Reason::handed_to_adaptor);
   return std::nullopt;
 }
 

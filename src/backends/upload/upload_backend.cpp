@@ -27,19 +27,19 @@ FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account
 }
 
 // Of an exchange that ended without an answer.
-const char* fateAfter(http::HTTPError::Kind kind) {
+wire::Reason fateAfter(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
-      return "file lost: the exchange with the server failed";
+      return wire::Reason::file_exchange_failed;
     case http::HTTPError::Kind::tooLarge:
-      return "file lost: the server's answer is too large";
+      return wire::Reason::file_answer_too_large;
     case http::HTTPError::Kind::tooMany:
     case http::HTTPError::Kind::shortage:
-      return "file lost: no exchange could begin for a shortage";
+      return wire::Reason::file_shortage;
     case http::HTTPError::Kind::stopping:
-      return "file lost: the daemon is stopping";
+      return wire::Reason::file_stopped;
   }
-  return "";
+  return wire::Reason::file_exchange_failed;
 }
 
 void sayUnreadable(const std::string& path, int error) {
@@ -89,7 +89,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   auto request = uploadRequest(*url, {udid(), sessionID()}, path);
   if (!request) {
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
-    _counters.count("file lost: its upload address makes no request");
+    _counters.count(wire::Reason::file_bad_address);
     return false;
   }
   gzipped.become(*request);
@@ -104,21 +104,21 @@ std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile
   const auto file = FileSnapshot::of(lent ? lent->descriptor() : -1);
   if (!file) {
     logError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
-    _counters.count("file refused: nothing lent, or no regular file");
+    _counters.count(wire::Reason::file_not_regular);
     return std::nullopt;
   }
   if (file->size() > FileSnapshot::kMostBytes) {
     logError("UploadBackend(uploadFileAtPath): File %s has %lld bytes: at most %lld are uploaded",
              path.c_str(), static_cast<long long>(file->size()),
              static_cast<long long>(FileSnapshot::kMostBytes));
-    _counters.count("file refused: too large");
+    _counters.count(wire::Reason::file_too_large);
     return std::nullopt;
   }
   const auto content = file->content();
   if (content == FileSnapshot::Content::some) return file;
   if (content == FileSnapshot::Content::unreadable) sayUnreadable(path, errno);
   logError("UploadBackend(uploadFileAtPath): Input file is empty");
-  _counters.count("file refused: empty or unreadable");
+  _counters.count(wire::Reason::file_empty);
   return std::nullopt;
 }
 
@@ -131,23 +131,23 @@ bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::s
       "UploadBackend(uploadFileAtPath): File %s lies on a file system of type %s, whose reads may never "
       "end: only a copy of it can be uploaded",
       path.c_str(), origin.fileSystem.c_str());
-  _counters.count("file refused: others serve its file system");
+  _counters.count(wire::Reason::file_foreign);
   return true;
 }
 
 // False: it failed, which has been said and counted.
 bool UploadBackend::compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const {
-  const char* fate = "file lost: it could not be compressed";
+  std::optional<wire::Reason> fate = wire::Reason::file_not_compressed;
   const auto next = [&](char* bytes, std::size_t room) -> std::optional<std::size_t> {
     if (_http.stopping()) {
-      fate = nullptr;
+      fate.reset();
       sayStopping();
       return std::nullopt;
     }
     const auto count = file.read(bytes, room);
     if (!count) {
       sayUnreadable(path, errno);
-      fate = "file lost: it could not be read";
+      fate = wire::Reason::file_unreadable;
     }
     return count;
   };
@@ -155,17 +155,17 @@ bool UploadBackend::compress(FileSnapshot& file, const std::string& path, Compre
     if (into.append(bytes)) return true;
     logError("UploadBackend(uploadFileAtPath): No room for the compressed bytes of %s in %s: %s",
              path.c_str(), _scratchDirectory.c_str(), std::strerror(errno));
-    fate = "file lost: no room for its compressed bytes";
+    fate = wire::Reason::file_no_room;
     return false;
   };
   if (support::gzipDeflate(next, keep)) return true;
-  if (fate) _counters.count(fate);
+  if (fate) _counters.count(*fate);
   return false;
 }
 
 void UploadBackend::sayStopping() const {
   logError("UploadBackend(uploadFileAtPath): The daemon is stopping");
-  _counters.count("file lost: the daemon is stopping");
+  _counters.count(wire::Reason::file_stopped);
 }
 
 // Says and counts how the exchange ended, too.
@@ -173,7 +173,7 @@ bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& ans
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",
              answer.ok() ? "(null)" : answer.error().description.c_str());
-    _counters.count(answer.ok() ? "file not confirmed" : fateAfter(answer.error().kind));
+    _counters.count(answer.ok() ? wire::Reason::file_not_confirmed : fateAfter(answer.error().kind));
     return false;
   }
   const std::string& body = answer.value().body;
@@ -181,7 +181,7 @@ bool UploadBackend::confirms(const std::string& url, const http::HTTPResult& ans
   logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", url.c_str(),
            text ? body.c_str() : "(undecodable)");
   const bool confirmed = text && body.find(kConfirmation) != std::string::npos;
-  _counters.count(confirmed ? "file uploaded" : "file not confirmed");
+  _counters.count(confirmed ? wire::Reason::file_uploaded : wire::Reason::file_not_confirmed);
   return confirmed;
 }
 
@@ -190,11 +190,11 @@ void UploadBackend::remove(const platform::LentFile& lent, const FileSnapshot& f
   if (file.changed()) {
     logWarning("UploadBackend(uploadFileAtPath): File %s has changed since its upload began, so it stays",
                path.c_str());
-    _counters.count("file kept: it changed during its upload");
+    _counters.count(wire::Reason::file_changed);
     return;
   }
-  _counters.count(lent.askForRemoval() ? "file confirmed: its removal was asked for"
-                                       : "file confirmed: its removal could not be asked for");
+  _counters.count(lent.askForRemoval() ? wire::Reason::file_removal_asked
+                                       : wire::Reason::file_removal_not_asked);
 }
 
 std::optional<std::string> UploadBackend::uploadURL() const {

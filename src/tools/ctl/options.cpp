@@ -66,19 +66,19 @@ void addText(CLI::App& app, const std::string& name, std::optional<std::string>&
 void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) {
   const char* group = "Identity";
   addNumber<std::int32_t>(app, "--client-type", identity.clientType, std::numeric_limits<std::int32_t>::max(),
-                          "Chooses what is reported: 0 to 17 are defined")
+                          "Kind of client, which selects the storebag; 0 to 17 are defined")
       ->group(group);
   addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, std::numeric_limits<std::uint32_t>::max(),
-                           "The client's own number for this session")
+                           "The client's number for this session")
       ->group(group);
   addNumber<std::uint16_t>(app, "--client-version", identity.clientVersion,
                            std::numeric_limits<std::uint16_t>::max(), "The client's version, 0 to 65535")
       ->group(group);
   addText(app, "--client", texts.client, "User info \"clientName\"");
   addText(app, "--service", texts.service, "User info \"serviceName\"");
-  app.add_option(
-         "--user-info", texts.userInfo,
-         oneEach ? "More user info; repeat it for each entry" : "More user info, any number of entries")
+  app.add_option("--user-info", texts.userInfo,
+                 oneEach ? "More user info; repeat the option for each entry"
+                         : "More user info, any number of entries")
       ->type_name("KEY=VALUE")
       ->check(CLI::Validator(keyValueProblem, ""))
       ->group(group)
@@ -90,19 +90,20 @@ void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) 
       ->group(group);
 }
 
-constexpr const char* kSessionFooter = R"(One JSON object a line, answered by one line each, in order:
+constexpr const char* kSessionFooter =
+    R"(Reads one JSON object per line and answers each with one line, in order:
   {"op":"send","category":5,"type":1,"payload":{"codec":"opus"},"flag":0}
   {"op":"flush"}
   {"op":"states","userInfo":{"clientName":"phone"}}
   {"op":"displayURL"}
   {"op":"uploadFile","path":"a.log"}
   {"op":"uploadLogData","data":[{"file":"a.log"},1]}
-  {"op":"restart"}            start again
+  {"op":"restart"}            start the session again
   {"op":"sleep","ms":100}
-  {"op":"finish"}             the end of the input closes without it
-{"$date": seconds since 1970} is a date, {"$data": "base64"} is data.
+  {"op":"finish"}             finish the session; at the end of the input it is only closed
+{"$date": seconds since 1970} stands for a date, {"$data": "base64"} for data.
 
-With --aggregate the copies stand between the answers, one a line, null where there is nothing:
+With --aggregate, copies are printed between the answers, one per line, with null for absent values:
   {"op":"aggregated","sessionInfo":{…},"timestamp":…,"category":5,"type":1,"payload":{…}}
 
 Example:
@@ -129,9 +130,9 @@ CLI::App* addCommand(CLI::App& app, Options& options, Command command, const std
 }
 
 void addSession(CLI::App& app, Options& options, Texts& texts) {
-  CLI::App* session =
-      addCommand(app, options, Command::session, "session", "Start a session and run one operation a line");
-  session->add_flag("--aggregate", options.aggregate, "Print copies of the session's messages, too");
+  CLI::App* session = addCommand(app, options, Command::session, "session",
+                                 "Start a session and run one operation per input line");
+  session->add_flag("--aggregate", options.aggregate, "Also print copies of the session's messages");
   session->add_option("--input", options.input, "Read the lines from FILE instead of standard input")
       ->type_name("FILE");
   addIdentity(*session, options.identity, texts, false);
@@ -146,7 +147,7 @@ void addMessage(CLI::App& app, Options& options, Texts& texts) {
       ->required();
   app.add_option("payload", texts.payload,
                  "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
-                 "false booleans, everything else a text")
+                 "false become booleans, everything else becomes a text")
       ->type_name("")
       ->check(CLI::Validator(keyValueProblem, ""));
   addIdentity(app, options.identity, texts, true);
@@ -157,7 +158,7 @@ void addSend(CLI::App& app, Options& options, Texts& texts) {
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
   addMessage(*send, options, texts);
   addNumber<std::uint32_t>(*send, "--flag", options.flag, std::numeric_limits<std::uint32_t>::max(),
-                           "1 at once, 2 whatever the sampling says, 3 both; 0 neither");
+                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither");
   send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
 
@@ -166,8 +167,8 @@ void addOneShot(CLI::App& app, Options& options, Texts& texts) {
       addCommand(app, options, Command::oneShot, "one-shot", "Send one message without starting a session");
   addMessage(*oneShot, options, texts);
   oneShot->footer(
-      "Needs --client-type and --session-id. The reply is \"finished\", whatever became of the message,\n"
-      "or \"storebag not available\".\n\n"
+      "Needs --client-type and --session-id. The reply is \"finished\", whether or not the message was\n"
+      "reported, or \"storebag not available\".\n\n"
       "Example:\n  veltractl one-shot --client-type 7 --session-id 42 --category 5 --type 1 codec=opus");
 }
 
@@ -178,7 +179,7 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
   states->footer("Example:\n  veltractl states --client-type 7 --client phone --service ringer");
 
   CLI::App* url = addCommand(app, options, Command::displayURL, "display-url",
-                             "Show where a session's reports can be looked at");
+                             "Show the address at which a session's reports can be viewed");
   addIdentity(*url, options.identity, texts, false);
   url->footer("Example:\n  veltractl display-url --client-type 7");
 
@@ -194,8 +195,7 @@ void addUploads(CLI::App& app, Options& options, Texts& texts) {
       ->required();
   addIdentity(*file, options.identity, texts, true);
   file->footer(
-      "Waits for the server, and says what became of the file. Exit status 1, too, when it was not "
-      "uploaded.\n\n"
+      "Waits for the server and prints the result. The exit status is 1 if the file was not uploaded.\n\n"
       "Example:\n  veltractl upload --client-type 7 crash.log");
   CLI::App* logData =
       addCommand(app, options, Command::uploadLogData, "upload-log-data", "Upload an array of log data");
@@ -205,7 +205,7 @@ void addUploads(CLI::App& app, Options& options, Texts& texts) {
       ->required();
   addIdentity(*logData, options.identity, texts, true);
   logData->footer(
-      "Waits for the servers. Exit status 1, too, when nobody took it.\n\n"
+      "Waits for the servers. The exit status is 1 if no server accepted the data.\n\n"
       "Example:\n  veltractl upload-log-data --client-type 7 logs.json");
 }
 
@@ -215,15 +215,15 @@ void addGlobals(CLI::App& app, Options& options) {
       ->check(CLI::Validator(
           [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
           ""));
-  app.add_flag("--json", options.json, "Print stats as JSON; the other commands always do");
+  app.add_flag("--json", options.json, "Print stats as JSON; the other commands always print JSON");
   app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
   app.set_help_flag("-h,--help", "Print this help");
   app.require_subcommand(1);
   app.fallthrough();
   app.formatter(std::make_shared<Help>());
   app.footer(
-      "Exit status: 0 done, 1 the daemon refused or failed, 2 wrong usage.\n"
-      "`veltractl COMMAND --help` says more.\n\n"
+      "Exit status: 0 success, 1 the daemon refused or failed, 2 usage error.\n"
+      "For the options of a command, see `veltractl COMMAND --help`.\n\n"
       "Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
 
@@ -266,7 +266,8 @@ void putTogether(const Texts& texts, Options& options) {
 std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   Options options;
   Texts texts;
-  CLI::App app("Talk to veltrad: start sessions, send messages, see what became of them.", "veltractl");
+  CLI::App app("Start veltrad sessions, send messages, upload files and see what happened to them.",
+               "veltractl");
   addGlobals(app, options);
   addSession(app, options, texts);
   addSend(app, options, texts);

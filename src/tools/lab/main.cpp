@@ -16,30 +16,28 @@ using veltrad::lab::Directory;
 using veltrad::lab::Server;
 
 constexpr const char* kAbout =
-    "Plays the servers of the system on the loopback: over HTTPS storebags, signed, the event collector, log "
-    "data\nand uploads; over UDP the dashboard, with acknowledgements.\n"
-    "Prints one JSON line when it serves; writes what arrives to DIR/received; ends on SIGTERM or SIGINT.\n\n"
-    "  GET    /storebags/maple/NAME   DIR/storebags/NAME.plist or .json, signed; ${url} in its texts is this "
-    "server,\n"
-    "                                 the text ${dashboardPort} the dashboard's port as a number\n"
-    "  POST   /logdata                log data, answered with the place where it is stored\n"
-    "  POST   /upload                 a file, gzipped, answered {\"success\": true}\n"
-    "  POST   /events, /realtime, …   the event collector\n"
-    "  POST   /control                misbehave as the JSON object in the body says; DELETE: behave again\n"
-    "  GET    /received?kind=events   what arrived, one JSON object a line; also storebags, dashboard, "
-    "logdata, "
-    "uploads\n"
-    "  GET    /                       a page with the newest arrivals\n\n"
-    "Misbehaviour: path (a prefix), times, share (in a hundred), status, delayMs, dripMs (between the bytes "
-    "of\n"
-    "the body), cut, cutHalfway, stall, endless, sign (wrong, missing, none), lastModified, headers, body "
-    "(a\n"
-    "text or {\"$data\": base64}). A redirect is a status and a header:\n"
-    "  {\"path\": \"/events\", \"status\": 302, \"headers\": {\"Location\": \"/there\"}}\n"
-    "Datagrams have the path /dashboard; times, share and delayMs are for them too, and ack, how they are\n"
-    "acknowledged: drop, duplicate, reorder (behind the next one), short, long, foreign (another event\n"
-    "number), stranger (from another port):\n"
-    "  {\"path\": \"/dashboard\", \"share\": 30, \"ack\": \"drop\"}";
+    R"(Plays the servers of the system on the loopback interface. HTTPS: signed storebags, the event collector,
+log data and uploads. UDP: the dashboard, with acknowledgements.
+Prints one JSON line when it is ready, writes what arrives to DIR/received, and ends on SIGTERM or SIGINT.
+
+  GET    /storebags/maple/NAME   DIR/storebags/NAME.plist or .json, signed. In its texts ${url} is replaced by
+                                 the address of this server; the text ${dashboardPort} becomes the dashboard's
+                                 port as a number
+  POST   /logdata                log data; the answer is the place where it is stored
+  POST   /upload                 a gzipped file; the answer is {"success": true}
+  POST   /events, /realtime, …   the event collector
+  POST   /control                add a rule for misbehaviour: the body is JSON, see below. DELETE: remove all rules
+  GET    /received?kind=events   what arrived, one JSON object per line. Also: storebags, dashboard, logdata, uploads
+  GET    /                       a page with the newest arrivals
+
+Keys of a rule: path (a prefix), times, share (per cent), status, delayMs, dripMs (pause between the bytes of
+the body), cut, cutHalfway, stall, endless, sign (wrong, missing, none), lastModified, headers, body (a text or
+{"$data": base64}). A redirect is a status and a header:
+  {"path": "/events", "status": 302, "headers": {"Location": "/there"}}
+For datagrams the path is /dashboard. They use times, share, delayMs and ack, which changes the acknowledgement:
+drop, duplicate, reorder (send it after the next one), short, long, foreign (another event number), stranger
+(from another port):
+  {"path": "/dashboard", "share": 30, "ack": "drop"})";
 
 int fail(const std::string& why) {
   std::fprintf(stderr, "veltra-lab: %s\n", why.c_str());
@@ -90,16 +88,18 @@ int main(int argc, char** argv) {
   int maxAge = 86'400;
   std::vector<std::string> rules;
   CLI::App app{kAbout, "veltra-lab"};
-  app.add_option("--dir", path, "what the lab keeps: certificate, keys, storebags, received")
+  app.add_option("--dir", path, "Directory for the certificate, keys, storebags and received data")
       ->capture_default_str();
-  app.add_option("--port", port, "0: any that is free")->check(CLI::Range(0, 65'535))->capture_default_str();
-  app.add_option("--dashboard-port", dashboardPort, "UDP, on 127.0.0.1; 0: any that is free [as --port]")
+  app.add_option("--port", port, "HTTPS port; 0: any free port")
+      ->check(CLI::Range(0, 65'535))
+      ->capture_default_str();
+  app.add_option("--dashboard-port", dashboardPort, "UDP port on 127.0.0.1; 0: any free port [as --port]")
       ->check(CLI::Range(0, 65'535));
-  app.add_option("--max-age", maxAge, "seconds that storebags say they are fresh")
+  app.add_option("--max-age", maxAge, "Seconds for which storebags stay fresh")
       ->check(CLI::Range(0, 2'147'483'647))
       ->capture_default_str();
   app.add_option("--misbehave", rules,
-                 "a rule as JSON, for instance '{\"path\": \"/events\", \"status\": 503}'");
+                 "A rule as JSON, for instance '{\"path\": \"/events\", \"status\": 503}'");
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {

@@ -24,17 +24,18 @@ struct Arguments {
 void describe(CLI::App& app, Arguments& given) {
   app.require_subcommand(1);
   CLI::App* keygen =
-      app.add_subcommand("keygen", "Make a signing key: DIR/privateKey.pem and DIR/publicKey.der");
-  keygen->add_option("DIR", given.directory, "Where the files go; neither may exist")->required();
-  keygen->add_option("--bits", given.bits, "Length of the modulus")
+      app.add_subcommand("keygen", "Create a signing key: DIR/privateKey.pem and DIR/publicKey.der");
+  keygen->add_option("DIR", given.directory, "Directory for the two files, neither of which may exist")
+      ->required();
+  keygen->add_option("--bits", given.bits, "Length of the modulus in bits")
       ->check(CLI::Range(SigningKey::kFewestBits, SigningKey::kMostBits))
       ->capture_default_str();
   keygen->callback([&given] { given.outcome = veltrad::storebag::keygen(given.directory, given.bits); });
 
   CLI::App* sign = app.add_subcommand("sign", "Sign a storebag");
   sign->add_option("--key", given.key, "Private key in PEM form")->required();
-  sign->add_option("IN", given.in, "The storebag: a property list, or JSON")->required();
-  sign->add_option("-o,--output", given.out, "The container, as servers send it")->required();
+  sign->add_option("IN", given.in, "The storebag: a property list or JSON")->required();
+  sign->add_option("-o,--output", given.out, "The signed container to write")->required();
   sign->callback([&given] { given.outcome = veltrad::storebag::sign(given.key, given.in, given.out); });
 
   CLI::App* verify = app.add_subcommand("verify", "Verify a signed storebag as the daemon does");
@@ -43,12 +44,12 @@ void describe(CLI::App& app, Arguments& given) {
   verify->callback([&given] { given.outcome = veltrad::storebag::verify(given.key, given.file); });
 
   CLI::App* show = app.add_subcommand("show", "Print a storebag as JSON, without verifying it");
-  show->add_option("FILE", given.file, "A container, or a bare storebag")->required();
-  show->add_flag("--json", given.json, "In one line");
+  show->add_option("FILE", given.file, "A container or an unsigned storebag")->required();
+  show->add_flag("--json", given.json, "Print it on one line");
   show->callback([&given] { given.outcome = veltrad::storebag::show(given.file, given.json); });
 
-  CLI::App* lint = app.add_subcommand("lint", "Say what a storebag would do wrong, without verifying it");
-  lint->add_option("FILE", given.file, "A container, or a bare storebag")->required();
+  CLI::App* lint = app.add_subcommand("lint", "Report mistakes in a storebag, without verifying it");
+  lint->add_option("FILE", given.file, "A container or an unsigned storebag")->required();
   lint->callback([&given] { given.outcome = veltrad::storebag::lint(given.file); });
 }
 
@@ -56,7 +57,7 @@ void describe(CLI::App& app, Arguments& given) {
 
 int main(int count, char** arguments) {
   try {
-    CLI::App app("Makes, signs, verifies, shows and looks through storebags.", "veltra-storebag");
+    CLI::App app("Create signing keys; sign, verify, show and check storebags.", "veltra-storebag");
     Arguments given;
     describe(app, given);
     try {

@@ -1,4 +1,5 @@
-// An adaptor bundle with the fault that FAULT names; tests/e2e/test_adaptor.py says what becomes of each.
+// An adaptor bundle with the fault that FAULT names; tests/e2e/test_adaptor.py has the expected result of
+// each.
 #include <veltra/adaptor.h>
 
 #include <cstdlib>
