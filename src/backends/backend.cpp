@@ -10,12 +10,8 @@
 
 namespace veltrad::backends {
 
-VeltraBackend::VeltraBackend(std::string name, Dictionary profile, std::string productFamily,
-                             platform::Random& random)
-    : _name(std::move(name)),
-      _profile(std::make_shared<const Dictionary>(std::move(profile))),
-      _productFamily(std::move(productFamily)),
-      _samplingFactor(random.uniform()) {}
+VeltraBackend::VeltraBackend(std::string name, std::string productFamily, platform::Random& random)
+    : _name(std::move(name)), _productFamily(std::move(productFamily)), _samplingFactor(random.uniform()) {}
 
 std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
   unsigned char digest[32];

@@ -67,7 +67,6 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
   // Constant after construction.
   const std::string& name() const { return _name; }
-  const Dictionary& profile() const { return *_profile; }
   const std::string& productFamily() const { return _productFamily; }
   double samplingFactor() const { return _samplingFactor; }  // in [0, 1), drawn once
 
@@ -115,12 +114,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
  protected:
   // Stores copies and draws the sampling factor. The kinds' initWithName(…) come here.
-  VeltraBackend(std::string name, Dictionary profile, std::string productFamily, platform::Random& random);
+  VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
 
  private:
   // Constant after construction.
   const std::string _name;
-  const SharedDictionary _profile;
   const std::string _productFamily;
   const double _samplingFactor;
 

@@ -10,6 +10,7 @@
 #include "backends/dashboard/log_data_uploads.h"
 #include "backends/https/post_errors.h"
 #include "backends/upload/file_uploads.h"
+#include "config/storebag_content.h"
 
 namespace veltrad::config {
 class ProcessSettings;
@@ -56,6 +57,9 @@ struct BackendServices {
   std::string scratchDirectory = "/tmp";  // for files without a name
 };
 
+// Null: its back end reads nothing of it.
+using SharedProfile = std::shared_ptr<const config::Profile>;
+
 // Who has a back end made.
 struct BackendOwner {
   std::shared_ptr<platform::MemoryAccount> account = nullptr;  // null: nobody pays
@@ -65,8 +69,10 @@ struct BackendOwner {
 class BackendFactory {
  public:
   virtual ~BackendFactory() = default;
-  // Null: no such backend here, or it cannot work with this profile; one line has said so.
-  virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
+  // Null: no such backend here, or it cannot work with this profile; one line has said so. `profile` as the
+  // section of a storebag has it under the name.
+  virtual std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name,
+                                                            const SharedProfile& profile,
                                                             const std::optional<std::string>& productFamily,
                                                             std::int32_t clientType,
                                                             const BackendOwner& owner = {}) = 0;
@@ -76,7 +82,7 @@ class StandardBackendFactory final : public BackendFactory {
  public:
   explicit StandardBackendFactory(BackendServices services)
       : _services(services), _logData(services.http, services.counters) {}
-  std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const Value& profile,
+  std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     std::int32_t clientType,
                                                     const BackendOwner& owner = {}) override;

@@ -1,32 +1,30 @@
 // Picks from a client type's storebag the section of the process's environment. The caller's thread.
 #include "config/storebag_section.h"
 
-#include <algorithm>
-#include <limits>
+#include <iterator>
 
 #include "config/client_types.h"
 #include "config/process_settings.h"
+#include "config/storebag_content.h"
 #include "platform/log.h"
 
 namespace veltrad::config {
 namespace {
 
 constexpr std::uint32_t kSeedEnvironment = 3;
+constexpr std::uint32_t kReleaseEnvironment = 4;
 
-const Dictionary* sectionOf(const Dictionary& storebag, std::uint32_t environment, const char* name) {
-  const Dictionary* section = name != nullptr ? storebag.dictionary(name) : nullptr;
-  if (section != nullptr || environment != kSeedEnvironment) return section;
-  logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
-  return storebag.dictionary("release");
-}
-
-std::optional<std::int32_t> refreshCycleOf(const Dictionary& storebag) {
-  const Value* entry = storebag.find("refresh_cycle");
-  const std::optional<std::int64_t> seconds = entry != nullptr ? entry->toInt64() : std::nullopt;
-  if (!seconds) return std::nullopt;
-  constexpr std::int64_t kLeast = std::numeric_limits<std::int32_t>::min();
-  constexpr std::int64_t kMost = StorebagSections::kMostRefreshCycleSeconds;
-  return static_cast<std::int32_t>(std::clamp(*seconds, kLeast, kMost));
+// By the number of its environment; null: none.
+const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
+  const std::optional<Dictionary>* sections[] = {&storebag.development, &storebag.flornInternal,
+                                                 &storebag.seed, &storebag.release};
+  const std::uint32_t place = environment - 1;
+  if (place >= std::size(sections)) return nullptr;
+  if (environment == kSeedEnvironment && !storebag.seed) {
+    logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
+    return sectionOf(storebag, kReleaseEnvironment);
+  }
+  return *sections[place] ? &**sections[place] : nullptr;
 }
 
 }  // namespace
@@ -45,8 +43,7 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     return {};
   }
   const WholeStorebagAnswer whole = _download.fetchStorebagWithName(name, lastModified);
-  const Dictionary& storebag = whole.storebag;
-  StorebagSectionAnswer answer{whole, {}, {}};
+  StorebagSectionAnswer answer{whole, nullptr, {}};
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
              clientType);
@@ -57,9 +54,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     answer.attempted = false;
     return answer;
   }
-  const char* sectionName = sectionNameForEnvironment(*environment);
-  const Dictionary* section = sectionOf(storebag, *environment, sectionName);
+  const auto storebag = parsed<Storebag>(whole.storebag);
+  const Dictionary* section = sectionOf(storebag, *environment);
   if (section == nullptr) {
+    const char* sectionName = sectionNameForEnvironment(*environment);
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
@@ -67,10 +65,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     return answer;
   }
   answer.kind = Kind::fetched;
-  answer.section = *section;
-  if (const std::string* text = storebag.string("version")) answer.version = *text;
-  if (const auto cycle = refreshCycleOf(storebag)) {
-    answer.maxAge = *cycle;
+  answer.section = parseSection(*section);
+  answer.version = storebag.version;
+  if (storebag.refreshCycle) {
+    answer.maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
     logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
   }
   return answer;

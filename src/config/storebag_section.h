@@ -10,9 +10,6 @@ namespace veltrad::config {
 // the constructor takes must outlive it.
 class StorebagSections final : public StorebagSource {
  public:
-  // A cached copy stays fresh at most this long on the storebag's own word ("refresh_cycle").
-  static constexpr std::int32_t kMostRefreshCycleSeconds = 86'400;
-
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
   StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(

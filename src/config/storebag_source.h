@@ -2,12 +2,13 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 
-#include "base/value.h"
-
 namespace veltrad::config {
+
+struct StorebagSection;
 
 // What came of asking for a storebag.
 struct StorebagAnswer {
@@ -25,8 +26,8 @@ struct StorebagAnswer {
 };
 
 struct StorebagSectionAnswer : StorebagAnswer {
-  Dictionary section;                  // where it was fetched
-  std::optional<std::string> version;  // then, too: of its storebag, which need not state one
+  std::shared_ptr<const StorebagSection> section;  // where it was fetched, else null
+  std::optional<std::string> version;              // of its storebag, which need not state one
 };
 
 class StorebagSource {

@@ -4,6 +4,7 @@
 #include <cmath>
 
 #include "config/client_types.h"
+#include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "platform/clock.h"
 #include "platform/log.h"
@@ -17,8 +18,8 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
   return age < kSecondsBetweenAttempts ? CacheVerdict::wait : CacheVerdict::fetch;
 }
 
-std::shared_ptr<const Dictionary> StorebagCache::storebagForClientType(std::int32_t clientType,
-                                                                       RecursiveMutex& lock) {
+std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType,
+                                                                                    RecursiveMutex& lock) {
   const char* name = config::storebagNameForClientType(clientType);
   if (!name) return fetchAndCacheStorebag(clientType, nullptr, lock);
   for (;;) {
@@ -51,9 +52,9 @@ std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clie
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
 }
 
-std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int32_t clientType,
-                                                                       const char* name,
-                                                                       RecursiveMutex& lock) {
+std::shared_ptr<const config::StorebagSection> StorebagCache::fetchAndCacheStorebag(std::int32_t clientType,
+                                                                                    const char* name,
+                                                                                    RecursiveMutex& lock) {
   logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
   if (!name) {
     static_cast<void>(_source.fetchStorebagForEnvironmentAndClientType(clientType, std::nullopt));
@@ -73,13 +74,12 @@ std::shared_ptr<const Dictionary> StorebagCache::fetchAndCacheStorebag(std::int3
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    if (record.data || answer.kind != Kind::fetched) return record.data;
-    return std::make_shared<const Dictionary>(std::move(answer.section));
+    return record.data || answer.kind != Kind::fetched ? record.data : answer.section;
   }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
   record.fetchSuccessful = answer.kind != Kind::failed;
   if (answer.kind == Kind::fetched) {
-    record.data = std::make_shared<const Dictionary>(std::move(answer.section));
+    record.data = std::move(answer.section);
     record.version = std::move(answer.version);
   } else if (answer.kind == Kind::failed) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);

@@ -9,10 +9,10 @@
 #include <string>
 
 #include "base/mutex.h"
-#include "base/value.h"
 
 namespace veltrad::config {
 class StorebagSource;
+struct StorebagSection;
 }  // namespace veltrad::config
 
 namespace veltrad::platform {
@@ -23,11 +23,12 @@ namespace veltrad::daemon {
 
 // What is kept of one storebag. Made at the first fetch for its name, never removed.
 struct StorebagRecord {
-  std::shared_ptr<const Dictionary> data;  // "StorebagData": the section last obtained; kept through failures
-  std::optional<std::string> version;      // "StorebagVersion"
-  double fetchTime = 0;          // "StorebagFetchTime": when the last attempt ended, seconds since 1970
-  bool fetchSuccessful = false;  // "StorebagFetchState": "Fetch Successful" or "Fetch Failure"
-  std::int32_t maxAge = 0;       // "StorebagMaxAge", seconds
+  std::shared_ptr<const config::StorebagSection>
+      data;                            // "StorebagData": the section last obtained; kept through failures
+  std::optional<std::string> version;  // "StorebagVersion"
+  double fetchTime = 0;                // "StorebagFetchTime": when the last attempt ended, seconds since 1970
+  bool fetchSuccessful = false;        // "StorebagFetchState": "Fetch Successful" or "Fetch Failure"
+  std::int32_t maxAge = 0;             // "StorebagMaxAge", seconds
   std::optional<std::string> lastModified;  // "StorebagLastModified"
   bool attempted = false;                   // a first attempt has ended
   bool beingFetched = false;                // requests for this name wait and look again
@@ -48,14 +49,15 @@ class StorebagCache {
 
   // `lock` is the agent's, held by every caller. The section for the client type, or null: may wait for an
   // exchange, with the lock let go, so the lock is held exactly once when it is called.
-  std::shared_ptr<const Dictionary> storebagForClientType(std::int32_t clientType, RecursiveMutex& lock)
-      REQUIRES(lock);
+  std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType,
+                                                                       RecursiveMutex& lock) REQUIRES(lock);
   std::optional<std::string> versionForClientType(std::int32_t clientType) const;
 
  private:
   // What the session gets.
-  std::shared_ptr<const Dictionary> fetchAndCacheStorebag(std::int32_t clientType, const char* name,
-                                                          RecursiveMutex& lock) REQUIRES(lock);
+  std::shared_ptr<const config::StorebagSection> fetchAndCacheStorebag(std::int32_t clientType,
+                                                                       const char* name, RecursiveMutex& lock)
+      REQUIRES(lock);
 
   config::StorebagSource& _source;
   const platform::Clock& _clock;

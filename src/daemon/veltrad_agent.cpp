@@ -89,7 +89,8 @@ void VeltradAgent::leaveCorrelatedList(const session::VeltradSession& session) {
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
-std::shared_ptr<const Dictionary> VeltradAgent::storebagForSession(const session::VeltradSession& session) {
+std::shared_ptr<const config::StorebagSection> VeltradAgent::storebagForSession(
+    const session::VeltradSession& session) {
   const std::int32_t clientType = session.clientType().value_or(0);
   logDebug("storebagForSession: Retrieving storebag for session %u with client type %d", session.sessionID(),
            clientType);

@@ -33,7 +33,8 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   bool listener(ipc::Listener& listener,
                 const std::shared_ptr<ipc::Connection>& shouldAcceptNewConnection) override;
 
-  std::shared_ptr<const Dictionary> storebagForSession(const session::VeltradSession& session) override;
+  std::shared_ptr<const config::StorebagSection> storebagForSession(
+      const session::VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const session::VeltradSession& session) override;
   void changeIdentity(const std::function<void()>& change) override;
   void userInfoUpdatedForSession(const std::shared_ptr<session::VeltradSession>& session) override;

@@ -2,6 +2,7 @@
 #include "session/backend_set.h"
 
 #include "backends/backend_factory.h"
+#include "config/storebag_content.h"
 #include "platform/clock.h"
 #include "platform/log.h"
 #include "support/device_identity.h"
@@ -10,7 +11,8 @@
 
 namespace veltrad::session {
 
-std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
+std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
+                                                 const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo,
                                                  const backends::SharedDictionary& userInfo,
                                                  const std::string& deviceID) {
@@ -32,7 +34,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, co
 
   const std::int32_t clientType = sessionInfo->int32(wire::kVeltraSessionInfoClientType).value_or(0);
   const auto made = std::make_shared<BackendSet>();
-  for (const auto& [name, profile] : *storebag) {
+  for (const auto& [name, profile] : storebag->backends) {
     const auto backend = making.factory.newBackendWithName(name, profile, productFamily, clientType,
                                                            {making.account, making.oneShot});
     if (!backend) continue;

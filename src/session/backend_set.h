@@ -13,6 +13,10 @@ namespace veltrad::backends {
 class BackendFactory;
 }  // namespace veltrad::backends
 
+namespace veltrad::config {
+struct StorebagSection;
+}  // namespace veltrad::config
+
 namespace veltrad::platform {
 class Clock;
 class MemoryAccount;
@@ -39,7 +43,8 @@ struct BackendMaking {
 
 // One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,
 // with one error line, without a storebag or without session info. `deviceID` may be empty.
-std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making, const Dictionary* storebag,
+std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
+                                                 const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo,
                                                  const backends::SharedDictionary& userInfo,
                                                  const std::string& deviceID);

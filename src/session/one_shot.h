@@ -15,7 +15,7 @@ namespace veltrad::session {
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
   backends::SharedDictionary userInfo;  // null: none
-  const Dictionary* storebag = nullptr;
+  const config::StorebagSection* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   const Dictionary* payload = nullptr;  // null: none

@@ -7,7 +7,9 @@
 #include <optional>
 #include <string>
 
-#include "base/value.h"
+namespace veltrad::config {
+struct StorebagSection;
+}  // namespace veltrad::config
 
 namespace veltrad::session {
 
@@ -18,7 +20,8 @@ class VeltradSessionDelegate {
   virtual ~VeltradSessionDelegate() = default;
 
   // The storebag section for the session's client type, or null. May download and block for the exchange.
-  virtual std::shared_ptr<const Dictionary> storebagForSession(const VeltradSession& session) = 0;
+  virtual std::shared_ptr<const config::StorebagSection> storebagForSession(
+      const VeltradSession& session) = 0;
   // Never downloads.
   virtual std::optional<std::string> storebagVersionForSession(const VeltradSession& session) = 0;
   // Runs `change` under the registry's lock: a session that changes its user info and joins another list in

@@ -239,7 +239,7 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   keepSessionInfo(kept);
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", sessionID());
-  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::no_storebag);
     if (reply) reply("storebag not available");

@@ -124,7 +124,7 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", sessionID());
-  const backends::SharedDictionary storebag = _sessionDelegate.storebagForSession(*this);
+  const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
@@ -141,7 +141,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::createBackendsWithStorebag(const Dictionary& storebag) {
+void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", sessionID());
   const backends::SharedDictionary info = sessionInfo();
   // It may have been out of reach when the client connected.

@@ -105,7 +105,7 @@ class VeltradSession final : public wire::ClientSessionInterface,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
   void sendStartMessage();
-  void createBackendsWithStorebag(const Dictionary& storebag);
+  void createBackendsWithStorebag(const config::StorebagSection& storebag);
   void updateUserInfoForBackends();
   void updateReportingStates();
   std::optional<std::vector<std::string>> fetchReportingStates() const;

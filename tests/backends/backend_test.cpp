@@ -10,7 +10,7 @@ namespace {
 
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   struct Counting final : backends::VeltraBackend {
-    explicit Counting(platform::Random& random) : backends::VeltraBackend("x", {}, "", random) {}
+    explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
     using backends::VeltraBackend::sendMessage;
     std::optional<std::string> sendMessage(const Dictionary*, platform::TimeValue, std::uint16_t,
                                            std::uint16_t, std::uint16_t eventID, std::int32_t) override {

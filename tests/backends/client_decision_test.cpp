@@ -36,10 +36,15 @@ TEST(ClientDecision, HoldsAtItsBorders) {
   for (const auto& [changes, who, state, reason] : cases) {
     Dictionary entry{{"locale_whitelist", Array{"de"}}, {"filters", Array{}}, {"sampling_threshold", 0.5}};
     entry.merge(changes);
-    const backends::ClientVerdict verdict = backends::decideOnClient(entry, who);
+    const backends::ClientVerdict verdict =
+        backends::decideOnClient(config::parsed<config::ClientEntry>(entry), who);
     EXPECT_EQ(verdict.state, state) << formats::writeJSON(changes);
     EXPECT_TRUE(verdict.reason == reason) << formats::writeJSON(changes);
   }
+}
+
+config::Filters parsed(const Array& filters) {
+  return *config::parsed<config::ClientEntry>({{"filters", filters}}).filters;
 }
 
 TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
@@ -56,16 +61,18 @@ TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
       {{Dictionary{{"action", "remove"}}, "junk"}, event, event},
       {{filter("n", "remove", {{"method", 0}, {"status", 0}})}, {{"n", 1}}, {}}};
   for (const auto& [filters, before, after] : rows) {
+    const auto given = parsed(filters);
     backends::FilterTable table;
-    table.createFiltersFromArray(filters);
+    table.createFiltersFromArray(given);
     table.createFiltersFromArray({});
     Dictionary filtered = before;
     table.filterEvent(filtered);
     EXPECT_EQ(filtered, after) << formats::writeJSON(filters);
   }
+  const auto first = parsed({filter("mac", "remove")}), second = parsed({filter("other", "remove")});
   backends::FilterTable table;
-  table.createFiltersFromArray({filter("mac", "remove")});
-  table.createFiltersFromArray({filter("other", "remove")});
+  table.createFiltersFromArray(first);
+  table.createFiltersFromArray(second);
   Dictionary kept = event;
   EXPECT_EQ(table.filterEvent(kept).removed, 0u);
 }

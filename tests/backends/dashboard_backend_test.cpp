@@ -44,14 +44,18 @@ struct DashboardServer {
   std::uint16_t port = 0;
 };
 
+backends::SharedProfile parsed(const Dictionary& profile) {
+  return config::parseSection({{"dashboard", profile}})->backends.at("dashboard");
+}
+
 class Dashboard : public ::testing::Test {
  protected:
   std::shared_ptr<backends::VeltraBackend> make(const Dictionary& more = {},
                                                 const backends::BackendOwner& owner = {}) {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", unsigned{server.port}}};
     profile.merge(more);
-    return configured(
-        world.factory.newBackendWithName(wire::kVeltraBackendDashboard, profile, "Desktop", 7, owner));
+    return configured(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile),
+                                                       "Desktop", 7, owner));
   }
   // A message that nobody acknowledges, and the end of its back end.
   void sendAndEnd(const backends::BackendOwner& owner) {
@@ -164,7 +168,8 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   for (int i = 0; i < 3; ++i) made.push_back(make({}, {account}));
   log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
   const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
-  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, profile, "Desktop", 7), nullptr);
+  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop", 7),
+            nullptr);
 }
 
 }  // namespace

@@ -7,6 +7,7 @@
 #include <climits>
 
 #include "config/storebag_container.h"
+#include "config/storebag_content.h"
 #include "config/storebag_section.h"
 #include "configuration.h"
 #include "formats/property_list.h"
@@ -154,7 +155,7 @@ TEST(StorebagSections, ChooseByEnvironment) {
     SCOPED_TRACE(environment);
     const Choice fetch(environment, storebag, lines);
     EXPECT_EQ(fetch.kind, section ? Kind::fetched : Kind::failed);
-    EXPECT_EQ(fetch.section, section.value_or(Dictionary{}));
+    EXPECT_EQ(fetch.section ? std::optional(fetch.section->asGiven) : std::nullopt, section);
     EXPECT_EQ(fetch.version, version);
     EXPECT_EQ(fetch.maxAge, 600);
   }

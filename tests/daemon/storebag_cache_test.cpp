@@ -7,6 +7,7 @@
 #include <mutex>
 #include <thread>
 
+#include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
@@ -26,7 +27,7 @@ struct Source final : config::StorebagSource {
     conditional = lastModified;
     const Kind kind = section ? Kind::fetched : answersNotModified ? Kind::notModified : Kind::failed;
     return {{kind, attempts, age, newLastModified.empty() ? lastModified : newLastModified},
-            section.value_or(Dictionary{}),
+            section,
             "v" + std::to_string(fetches)};
   }
   void waitForFetches(int count) {
@@ -41,7 +42,7 @@ struct Source final : config::StorebagSource {
 
   std::mutex mutex;
   std::condition_variable changed;
-  std::optional<Dictionary> section = Dictionary{};
+  std::shared_ptr<const config::StorebagSection> section = config::parseSection({});
   std::optional<std::string> conditional;
   std::string newLastModified;
   std::int32_t age = 3600;
@@ -53,7 +54,7 @@ struct Source final : config::StorebagSource {
 
 class Cache : public ::testing::Test {
  protected:
-  std::shared_ptr<const Dictionary> ask(std::int32_t clientType) {
+  std::shared_ptr<const config::StorebagSection> ask(std::int32_t clientType) {
     const Lock held(_lock);
     return cache.storebagForClientType(clientType, _lock);
   }
@@ -74,28 +75,28 @@ class Cache : public ::testing::Test {
 // Nothing is recorded, so the next session asks again at once.
 TEST_F(Cache, ADownloadThatWasNoAttemptLeavesTheRecordAsItWas) {
   source.attempts = false;
-  const Dictionary standsIn{{"mivo", Dictionary{}}};
-  source.section = std::nullopt;
+  const auto standsIn = config::parseSection({{"mivo", Dictionary{}}});
+  source.section = nullptr;
   EXPECT_EQ(ask(7), nullptr);
   source.section = standsIn;
-  EXPECT_EQ(*ask(7), standsIn);
+  EXPECT_EQ(ask(7), standsIn);
   EXPECT_EQ(version(7), std::nullopt);
   source.attempts = true;
-  const Dictionary kept{{"httppost", Dictionary{}}};
+  const auto kept = config::parseSection({{"httppost", Dictionary{}}});
   source.section = kept;
   source.age = 100;
-  EXPECT_EQ(*ask(7), kept);
+  EXPECT_EQ(ask(7), kept);
   EXPECT_EQ(source.fetches, 3);
   clock.advance(101);
   source.attempts = false;
   source.newLastModified = "later";
-  for (const auto& section : {std::optional(standsIn), std::optional<Dictionary>()}) {
+  for (const auto& section : {standsIn, std::shared_ptr<const config::StorebagSection>()}) {
     source.section = section;
-    EXPECT_EQ(*ask(7), kept);
+    EXPECT_EQ(ask(7), kept);
   }
   source.attempts = true;
   source.answersNotModified = true;
-  EXPECT_EQ(*ask(7), kept);
+  EXPECT_EQ(ask(7), kept);
   EXPECT_EQ(source.fetches, 6);
   EXPECT_EQ(source.conditional, std::nullopt);
 }
@@ -152,7 +153,7 @@ TEST_F(Cache, ATypeWithoutAStorebagLeavesNoRecord) {
 
 TEST_F(Cache, OthersGoOnDuringADownloadAndTheSameNameWaits) {
   source.hold = true;
-  std::shared_ptr<const Dictionary> first, second;
+  std::shared_ptr<const config::StorebagSection> first, second;
   std::thread fetching([&] { first = ask(7); });
   source.waitForFetches(1);
   std::thread waiting([&] { second = ask(11); });

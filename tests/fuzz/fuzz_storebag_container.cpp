@@ -7,6 +7,7 @@
 
 #include "base/base64.h"
 #include "config/storebag_container.h"
+#include "config/storebag_content.h"
 #include "config/storebag_download.h"
 #include "config/storebag_key.h"
 
@@ -45,7 +46,10 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (decoded && key.verifies(decoded->bag, decoded->signature) && decoded->bag != signedBag) std::abort();
   }
   // What only a signed bag reaches, and what only a header does.
-  config::parseStorebagBag(bytes);
+  if (const auto bag = config::parseStorebagBag(bytes)) {
+    const auto storebag = config::parsed<config::Storebag>(*bag);
+    config::parseSection(storebag.release.value_or(*bag));
+  }
   config::maxAgeOfCacheControl(bytes);
   return 0;
 }

@@ -12,14 +12,14 @@ constexpr const char* kEnergyLogEvent = "Sonvaird-VLT";
 }  // namespace
 
 std::shared_ptr<AmperyBackend> AmperyBackend::initWithName(const BackendServices& services,
-                                                           const std::string& name, const Dictionary* profile,
+                                                           const std::string& name,
                                                            const std::string& productFamily) {
-  return std::shared_ptr<AmperyBackend>(new AmperyBackend(services, name, profile, productFamily));
+  return std::shared_ptr<AmperyBackend>(new AmperyBackend(services, name, productFamily));
 }
 
 AmperyBackend::AmperyBackend(const BackendServices& services, const std::string& name,
-                             const Dictionary* profile, const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
+                             const std::string& productFamily)
+    : VeltraBackend(name, productFamily, services.random),
       _energyLog(services.energyLog),
       _counters(services.counters) {}
 

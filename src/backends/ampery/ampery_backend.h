@@ -14,7 +14,6 @@ namespace veltrad::backends {
 class AmperyBackend final : public VeltraBackend {
  public:
   static std::shared_ptr<AmperyBackend> initWithName(const BackendServices& services, const std::string& name,
-                                                     const Dictionary* profile,
                                                      const std::string& productFamily);
 
   using VeltraBackend::sendMessage;
@@ -24,8 +23,7 @@ class AmperyBackend final : public VeltraBackend {
                                          std::int32_t flag) override;
 
  private:
-  AmperyBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
-                const std::string& productFamily);
+  AmperyBackend(const BackendServices& services, const std::string& name, const std::string& productFamily);
 
   // Constant after construction.
   EnergyLog& _energyLog;

@@ -22,23 +22,12 @@ namespace {
 constexpr std::chrono::milliseconds kDefaultPeriod{500};
 constexpr std::int32_t kMicrosecondsPerFraction = 4000;
 
-std::optional<std::string> textOf(const Dictionary* profile, std::string_view key) {
-  const std::string* text = profile ? profile->string(key) : nullptr;
-  return text ? std::optional(*text) : std::nullopt;
-}
-
-std::chrono::milliseconds periodOf(const Dictionary* profile) {
-  const std::int32_t asked = profile ? profile->int32("reliable").value_or(0) : 0;
-  return asked > 0 ? std::chrono::milliseconds(asked) : kDefaultPeriod;
-}
-
-bool namesServer(const Dictionary& profile) {
-  const bool ip = profile.string("ip");
-  const bool port = profile.uint16("port").has_value();
-  if (!ip || !port) {
-    logError("DashboardBackend(initWithName): can't resolve server %s", ip ? "port" : "IP");
+bool namesServer(const config::DashboardProfile& profile) {
+  const bool named = profile.ip && profile.port;
+  if (!named) {
+    logError("DashboardBackend(initWithName): can't resolve server %s", profile.ip ? "port" : "IP");
   }
-  return ip && port;
+  return named;
 }
 
 // One more socket; those that linger for others make room for it.
@@ -71,11 +60,12 @@ struct Server {
   }
 };
 
-Server serverOf(const Dictionary* profile, const std::optional<std::string>& serverIP,
+Server serverOf(const config::DashboardProfile* profile, const std::optional<std::string>& serverIP,
                 std::uint16_t serverPort) {
   if (!profile) return {serverIP ? parseIPv4Address(*serverIP, serverPort) : std::nullopt};
-  return {parseIPv4Address(*profile->string("ip"), *profile->uint16("port")), profile->contains("reliable"),
-          periodOf(profile)};
+  const auto [reliable, asked] = profile->reliable;
+  return {parseIPv4Address(*profile->ip, *profile->port), reliable,
+          asked > 0 ? std::chrono::milliseconds(asked) : kDefaultPeriod};
 }
 
 // Null: one error line has said why.
@@ -110,10 +100,9 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
                                                                  const std::string& name,
-                                                                 const Dictionary* profile,
+                                                                 const config::DashboardProfile* profile,
                                                                  const std::string& productFamily) {
-  const auto port = profile ? profile->uint16("port").value_or(0) : std::uint16_t{0};
-  return initWithName(making, name, profile, textOf(profile, "ip"), port, productFamily);
+  return initWithName(making, name, profile, std::nullopt, 0, productFamily);
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
@@ -126,7 +115,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const Dashboard
 }
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
-    const DashboardMaking& making, const std::string& name, const Dictionary* profile,
+    const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
     const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
   if (profile && !namesServer(*profile)) return nullptr;
   const Server server = serverOf(profile, serverIP, serverPort);
@@ -135,7 +124,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
   auto socket = queue ? std::nullopt : openSocket(*making.queues);
   if (!queue && !socket) return nullptr;
   std::shared_ptr<DashboardBackend> backend(new DashboardBackend(making, name, profile, productFamily));
-  backend->setDisplayURL(textOf(profile, "display_url"));
+  if (profile) backend->setDisplayURL(profile->displayURL);
   if (!profile && !serverIP) {
     logError("DashboardBackend(initWithName): initWitName with all null params.");
     return nullptr;
@@ -146,13 +135,13 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
 }
 
 DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::string& name,
-                                   const Dictionary* profile, const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, making.services.random),
+                                   const config::DashboardProfile* profile, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.services.random),
       _uploads(making.uploads),
       _clock(making.services.clock),
       _counters(making.services.counters),
       _usingProfile(profile != nullptr),
-      _postURL(textOf(profile, "post_url")) {}
+      _postURL(profile ? profile->postURL : std::nullopt) {}
 
 DashboardBackend::~DashboardBackend() {
   cleanup();

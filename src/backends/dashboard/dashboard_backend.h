@@ -32,7 +32,8 @@ class DashboardBackend final : public VeltraBackend {
   // (for log data) and "reliable": present switches acknowledgements on; its value, from 1 on, is the period
   // of the ticks in milliseconds, else 500.
   static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
-                                                        const std::string& name, const Dictionary* profile,
+                                                        const std::string& name,
+                                                        const config::DashboardProfile* profile,
                                                         const std::string& productFamily);
   // To a server named outright, with acknowledgements and a period of 500 ms.
   static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
@@ -41,11 +42,9 @@ class DashboardBackend final : public VeltraBackend {
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
   // A profile goes before the server named.
-  static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
-                                                        const std::string& name, const Dictionary* profile,
-                                                        const std::optional<std::string>& serverIP,
-                                                        std::uint16_t serverPort,
-                                                        const std::string& productFamily);
+  static std::shared_ptr<DashboardBackend> initWithName(
+      const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
+      const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
   using VeltraBackend::sendMessage;
@@ -57,8 +56,8 @@ class DashboardBackend final : public VeltraBackend {
   void cleanup() override;
 
  private:
-  DashboardBackend(const DashboardMaking& making, const std::string& name, const Dictionary* profile,
-                   const std::string& productFamily);
+  DashboardBackend(const DashboardMaking& making, const std::string& name,
+                   const config::DashboardProfile* profile, const std::string& productFamily);
 
   tagReportingPacketHeader headerOf(platform::TimeValue timestamp, std::uint16_t method,
                                     std::uint16_t respCode, std::uint16_t eventID) const;

@@ -1,6 +1,8 @@
 // The decision on a client entry, step by step.
 #include "backends/https/client_decision.h"
 
+#include <algorithm>
+
 #include "backends/backend.h"
 #include "backends/https/text_lists.h"
 
@@ -8,41 +10,36 @@ namespace veltrad::backends {
 
 namespace {
 // The first element whose "country" array holds the country, letter case respected; or null.
-const Dictionary* countryEntry(const Dictionary& entry, const std::optional<std::string>& country) {
-  const Array* elements = entry.array("per_country_sampling_thresholds");
-  if (!elements || !country) return nullptr;
-  for (const Value& element : *elements) {
-    const Dictionary* candidate = element.asDictionary();
-    const Array* countries = candidate ? candidate->array("country") : nullptr;
-    if (!countries) continue;
-    for (const Value& listed : *countries) {
-      const std::string* code = listed.asString();
-      if (code && *code == *country) return candidate;
-    }
+const config::CountryThreshold* countryEntry(const config::ClientEntry& entry,
+                                             const std::optional<std::string>& country) {
+  if (!entry.perCountrySamplingThresholds || !country) return nullptr;
+  for (const config::CountryThreshold& candidate : *entry.perCountrySamplingThresholds) {
+    const auto& listed = candidate.country.texts;
+    if (std::find(listed.begin(), listed.end(), *country) != listed.end()) return &candidate;
   }
   return nullptr;
 }
 
-std::optional<wire::Reason> refusalOfLists(const Dictionary& entry, const ClientFacts& facts) {
-  if (!matchStringWithList(textsOf(entry.array("locale_whitelist")), facts.country, false)) {
+std::optional<wire::Reason> refusalOfLists(const config::ClientEntry& entry, const ClientFacts& facts) {
+  if (!matchStringWithList(entry.localeWhitelist.texts, facts.country, false)) {
     return wire::Reason::country_not_listed;
   }
-  if (!matchStringWithList(textsOf(entry.array("device_whitelist")), facts.productFamily, true)) {
+  if (!matchStringWithList(entry.deviceWhitelist.texts, facts.productFamily, true)) {
     return wire::Reason::device_not_listed;
   }
-  if (matchStringWithList(textsOf(entry.array("device_blacklist")), facts.hardwareType, false)) {
+  if (matchStringWithList(entry.deviceBlacklist.texts, facts.hardwareType, false)) {
     return wire::Reason::device_refused;
   }
   return std::nullopt;
 }
 
-void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientVerdict& verdict) {
+void decideOnSampling(const config::ClientEntry& entry, const ClientFacts& facts, ClientVerdict& verdict) {
   verdict.samplingReached = true;
-  verdict.threshold = entry.real("sampling_threshold");
-  if (const Dictionary* own = countryEntry(entry, facts.country)) {
+  verdict.threshold = entry.samplingThreshold;
+  if (const config::CountryThreshold* own = countryEntry(entry, facts.country)) {
     verdict.countryThreshold = true;
     verdict.thresholdBefore = verdict.threshold;
-    verdict.threshold = own->real("threshold");
+    verdict.threshold = own->threshold;
   }
   if (!verdict.threshold) {
     verdict.reason = wire::Reason::no_threshold;
@@ -54,7 +51,7 @@ void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientV
     return;
   }
   verdict.overrideReached = true;
-  verdict.overrideSampling = entry.real("override_sampling");
+  verdict.overrideSampling = entry.overrideSampling;
   if (!verdict.overrideSampling || facts.samplingFactor <= *verdict.overrideSampling) {
     verdict.state = kBackendHeld;
     verdict.reason = wire::Reason::held_by_sampling;
@@ -64,11 +61,11 @@ void decideOnSampling(const Dictionary& entry, const ClientFacts& facts, ClientV
 }
 }  // namespace
 
-ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts) {
+ClientVerdict decideOnClient(const config::ClientEntry& entry, const ClientFacts& facts) {
   ClientVerdict verdict;
   verdict.state = kBackendDisabled;
-  verdict.hierarchy = entry.int32("hierarchy").value_or(0);
-  verdict.overrideDNU = entry.int32("override_dnu").value_or(0);
+  verdict.hierarchy = entry.hierarchy;
+  verdict.overrideDNU = entry.overrideDNU;
   if (verdict.overrideDNU == 1) {
     verdict.dnuType = facts.consent ? 2 : 1;
   } else if (!facts.consent) {
@@ -77,7 +74,7 @@ ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts) 
   }
   verdict.reason = refusalOfLists(entry, facts);
   if (verdict.reason) return verdict;
-  verdict.filters = entry.array("filters");
+  verdict.filters = entry.filters ? &*entry.filters : nullptr;
   if (!verdict.filters) {
     verdict.reason = wire::Reason::no_filters;
     return verdict;

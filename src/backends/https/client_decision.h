@@ -6,7 +6,7 @@
 #include <optional>
 #include <string>
 
-#include "base/value.h"
+#include "config/client_entry.h"
 #include "wire/reasons.h"
 
 namespace veltrad::backends {
@@ -27,7 +27,7 @@ struct ClientVerdict {
   std::int32_t hierarchy = 0;
   std::int32_t overrideDNU = 0;  // the entry's own number; 1 overrides consent
   std::int32_t dnuType = 0;      // 0 consent respected; overridden: 1 without consent, 2 with it
-  const Array* filters = nullptr;
+  const config::Filters* filters = nullptr;
 
   bool samplingReached = false;
   std::optional<double> threshold;
@@ -39,6 +39,6 @@ struct ClientVerdict {
   std::optional<double> overrideSampling;
 };
 
-ClientVerdict decideOnClient(const Dictionary& entry, const ClientFacts& facts);
+ClientVerdict decideOnClient(const config::ClientEntry& entry, const ClientFacts& facts);
 
 }  // namespace veltrad::backends

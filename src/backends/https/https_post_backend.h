@@ -19,9 +19,10 @@ namespace veltrad::backends {
 class HTTPSPostBackend final : public VeltraBackend {
  public:
   // Null without a profile, a product family or the profile's "clients" (one error line).
-  static std::shared_ptr<HTTPSPostBackend> initWithName(const BackendServices& services, PostErrors& errors,
-                                                        const std::string& name, const Dictionary* profile,
-                                                        const std::optional<std::string>& productFamily);
+  static std::shared_ptr<HTTPSPostBackend> initWithName(
+      const BackendServices& services, PostErrors& errors, const std::string& name,
+      std::shared_ptr<const config::HTTPSPostProfile> profile,
+      const std::optional<std::string>& productFamily);
 
   void updateState() override;
   using VeltraBackend::sendMessage;
@@ -35,20 +36,20 @@ class HTTPSPostBackend final : public VeltraBackend {
 
  private:
   HTTPSPostBackend(const BackendServices& services, PostErrors& errors, const std::string& name,
-                   const Dictionary& profile, const std::string& productFamily);
+                   std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
   std::int32_t updateBackendState();
-  void applyExpedite(const Dictionary& entry);
-  std::int32_t reportForEveryone(const Array& clients);
-  std::int32_t reportForClient(const Dictionary& entry, const std::optional<std::string>& clientName,
+  void applyExpedite(const config::ClientEntry& entry);
+  std::int32_t reportForEveryone();
+  std::int32_t reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
                                const std::optional<std::string>& serviceName);
-  void logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+  void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                   const std::optional<std::string>& country) const;
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
   std::optional<std::string> getPersistentIdentifierForCustomClientIDSuffix(
       const std::optional<std::string>& clientName, const std::optional<std::string>& serviceName) const;
-  bool updatePostLink(const Dictionary& entry);
-  void resetBackendStateWithClient(const Dictionary* entry);
+  bool updatePostLink(const config::ClientEntry& entry);
+  void resetBackendStateWithClient(const config::ClientEntry* entry);
 
   Dictionary withStopFields(const Dictionary* payload) const;
   void prepareEventForMessage(Dictionary& event) const;
@@ -76,6 +77,7 @@ class HTTPSPostBackend final : public VeltraBackend {
 
   // Constant after construction.
   const BackendServices _services;
+  const std::shared_ptr<const config::HTTPSPostProfile> _profile;
   PostErrors& _errors;
   const bool _dnuEnabled;
   const bool _forceEventLogging;

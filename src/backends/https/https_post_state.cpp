@@ -1,5 +1,8 @@
 // The HTTPS post backend: construction, and whether and how it reports for the current client.
 #include "backends/https/https_post_backend.h"
+
+#include <algorithm>
+
 #include "backends/https/text_lists.h"
 #include "formats/json.h"
 #include "platform/counters.h"
@@ -34,15 +37,16 @@ bool textMeansYes(const std::optional<std::string>& text) {
 }
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
-    const BackendServices& services, PostErrors& errors, const std::string& name, const Dictionary* profile,
+    const BackendServices& services, PostErrors& errors, const std::string& name,
+    std::shared_ptr<const config::HTTPSPostProfile> profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
-  if (!profile->array("clients")) {
+  if (!profile->clients) {
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
     return nullptr;
   }
   std::shared_ptr<HTTPSPostBackend> made(
-      new HTTPSPostBackend(services, errors, name, *profile, *productFamily));
+      new HTTPSPostBackend(services, errors, name, std::move(profile), *productFamily));
   if (made->_uuidRespectDnu.empty() || made->_uuidOverrideDnu.empty()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -51,10 +55,12 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, PostErrors& errors,
-                                   const std::string& name, const Dictionary& profile,
+                                   const std::string& name,
+                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
                                    const std::string& productFamily)
-    : VeltraBackend(name, profile, productFamily, services.random),
+    : VeltraBackend(name, productFamily, services.random),
       _services(services),
+      _profile(std::move(profile)),
       _errors(errors),
       _dnuEnabled(diagnosticLogSubmissionEnabled(services.preferences)),
       _forceEventLogging(
@@ -72,7 +78,7 @@ HTTPSPostBackend::HTTPSPostBackend(const BackendServices& services, PostErrors& 
              _realtimePostURL->c_str());
   }
   _useDefaultRealtimePostURL = _realtimePostURL.has_value();
-  setDisplayURL(optionalText(profile.string("display_url")));
+  setDisplayURL(_profile->displayURL);
 }
 
 void HTTPSPostBackend::updateState() {
@@ -80,46 +86,39 @@ void HTTPSPostBackend::updateState() {
 }
 
 std::int32_t HTTPSPostBackend::updateBackendState() {
-  const Array* clients = profile().array("clients");
-  if (!clients) return kBackendDisabled;
   const SharedDictionary userInfo = userInfoDict();
   const auto clientName =
       optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoClientName) : nullptr);
   const auto serviceName =
       optionalText(userInfo ? userInfo->string(wire::kVeltraUserInfoServiceName) : nullptr);
-  const Dictionary* entry = nullptr;
-  for (const Value& client : *clients) {
-    const Dictionary* candidate = client.asDictionary();
-    if (!candidate || !matchClientNameAndServiceID(*candidate, clientName, serviceName)) continue;
-    entry = candidate;
-    break;
-  }
-  if (entry) applyExpedite(*entry);
-  if (!requireUserInfo()) return reportForEveryone(*clients);
+  const auto& clients = *_profile->clients;
+  const auto entry = std::find_if(clients.begin(), clients.end(), [&](const config::ClientEntry& candidate) {
+    return matchClientNameAndServiceID(candidate, clientName, serviceName);
+  });
+  const bool found = entry != clients.end();
+  if (found) applyExpedite(*entry);
+  if (!requireUserInfo()) return reportForEveryone();
   if (!userInfo) {
     _services.counters.count(wire::Reason::waits_for_user_info);
     return kBackendWaiting;
   }
-  if (!entry) {
+  if (!found) {
     _services.counters.count(wire::Reason::no_entry);
     return kBackendDisabled;
   }
   return reportForClient(*entry, clientName, serviceName);
 }
 
-std::int32_t HTTPSPostBackend::reportForEveryone(const Array& clients) {
-  const Dictionary* taken = nullptr;
-  for (const Value& client : clients) {
-    const Dictionary* entry = client.asDictionary();
-    if (!entry || !updatePostLink(*entry)) continue;
-    taken = entry;
-    break;
-  }
-  resetBackendStateWithClient(taken);
+std::int32_t HTTPSPostBackend::reportForEveryone() {
+  const auto& clients = *_profile->clients;
+  const auto taken =
+      std::find_if(clients.begin(), clients.end(),
+                   [this](const config::ClientEntry& candidate) { return updatePostLink(candidate); });
+  resetBackendStateWithClient(taken == clients.end() ? nullptr : &*taken);
   return kBackendReporting;
 }
 
-std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
+std::int32_t HTTPSPostBackend::reportForClient(const config::ClientEntry& entry,
                                                const std::optional<std::string>& clientName,
                                                const std::optional<std::string>& serviceName) {
   const auto country = _services.locale.countryCode();
@@ -136,7 +135,7 @@ std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
   if (!verdict.samplingReached) return kBackendDisabled;
 
   resetBackendStateWithClient(&entry);
-  if (entry.contains("custom_clientId")) {
+  if (entry.customClientID) {
     auto identifier = getPersistentIdentifierForCustomClientIDSuffix(clientName, serviceName);
     if (!identifier) {  // another would be no better than a wrong one
       _services.counters.count(wire::Reason::no_identifier);
@@ -153,11 +152,10 @@ std::int32_t HTTPSPostBackend::reportForClient(const Dictionary& entry,
   return verdict.state;
 }
 
-void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& verdict,
+void HTTPSPostBackend::logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                                   const std::optional<std::string>& country) const {
-  const auto printed = [&entry](const char* key) {
-    const Value* list = entry.find(key);
-    return list ? formats::writeJSON(*list) : std::string("(null)");
+  const auto printed = [](const config::TextList& list) {
+    return list.asGiven ? formats::writeJSON(*list.asGiven) : std::string("(null)");
   };
   switch (*verdict.reason) {
     case wire::Reason::no_consent:
@@ -165,15 +163,15 @@ void HTTPSPostBackend::logRefusal(const Dictionary& entry, const ClientVerdict& 
       break;
     case wire::Reason::country_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in country code list %s",
-               country ? country->c_str() : "(null)", printed("locale_whitelist").c_str());
+               country ? country->c_str() : "(null)", printed(entry.localeWhitelist).c_str());
       break;
     case wire::Reason::device_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
-               productFamily().c_str(), printed("device_whitelist").c_str());
+               productFamily().c_str(), printed(entry.deviceWhitelist).c_str());
       break;
     case wire::Reason::device_refused:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
-               hardwareType() ? hardwareType()->c_str() : "(null)", printed("device_blacklist").c_str());
+               hardwareType() ? hardwareType()->c_str() : "(null)", printed(entry.deviceBlacklist).c_str());
       break;
     case wire::Reason::no_filters:
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
@@ -204,28 +202,28 @@ std::optional<std::string> HTTPSPostBackend::getPersistentIdentifierForCustomCli
   return value;
 }
 
-void HTTPSPostBackend::applyExpedite(const Dictionary& entry) {
-  const auto expedite = entry.real("expedite");
-  if (!expedite) return;
-  setBatchEvents(*expedite == 0);
+void HTTPSPostBackend::applyExpedite(const config::ClientEntry& entry) {
+  if (!entry.expedite) return;
+  setBatchEvents(*entry.expedite == 0);
   logDebug("HTTPSPostBackend(updateBackendState): Store bag override  _batchEvent=%d", batchEvents());
 }
 
-bool HTTPSPostBackend::updatePostLink(const Dictionary& entry) {
+bool HTTPSPostBackend::updatePostLink(const config::ClientEntry& entry) {
   bool changed = false;
   if (!(_useDefaultPostURL && _postURL)) {
     _useDefaultPostURL = false;
-    if (const std::string* url = entry.string("post_url")) {
-      _postURL = *url;
-      logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", url->c_str());
+    if (entry.postURL) {
+      _postURL = entry.postURL;
+      logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for postURL", _postURL->c_str());
       changed = true;
     }
   }
   if (_useDefaultRealtimePostURL && _realtimePostURL) return changed;
   _useDefaultRealtimePostURL = false;
-  if (const std::string* url = entry.string("realtime_post_url")) {
-    _realtimePostURL = *url;
-    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL", url->c_str());
+  if (entry.realtimePostURL) {
+    _realtimePostURL = entry.realtimePostURL;
+    logDebug("HTTPSPostBackend(updatePostLink): Storebag '%s' for realtimePostURL",
+             _realtimePostURL->c_str());
   } else {
     _realtimePostURL = _postURL;
     logDebug("HTTPSPostBackend(updatePostLink): realtimePostURL defaults to postURL '%s'",
@@ -234,10 +232,10 @@ bool HTTPSPostBackend::updatePostLink(const Dictionary& entry) {
   return changed;
 }
 
-void HTTPSPostBackend::resetBackendStateWithClient(const Dictionary* entry) {
-  _eventThreshold = entry ? entry->int32("event_threshold").value_or(0) : 0;
+void HTTPSPostBackend::resetBackendStateWithClient(const config::ClientEntry* entry) {
+  _eventThreshold = entry ? entry->eventThreshold : 0;
   logDebug("resetBackendStateWithClient: event_threshold set to %d", _eventThreshold);
-  _extrasOnInternal = entry ? entry->int32("extras_on_internal").value_or(0) : 0;
+  _extrasOnInternal = entry ? entry->extrasOnInternal : 0;
   logDebug("setBackendStateWithClient: extras on internal is set to %d", _extrasOnInternal);
 }
 

@@ -23,30 +23,11 @@ bool matchStringWithList(const std::vector<std::string>& list, const std::option
                      [&](const std::string& item) { return containsIgnoringCase(*wholeString, item); });
 }
 
-std::vector<std::string> itemsBetweenCommas(const std::string* text) {
-  std::vector<std::string> items;
-  if (!text) return items;
-  std::size_t start = 0;
-  for (std::size_t comma; (comma = text->find(',', start)) != std::string::npos; start = comma + 1) {
-    items.push_back(text->substr(start, comma - start));
-  }
-  items.push_back(text->substr(start));
-  return items;
-}
-
-std::vector<std::string> textsOf(const Array* array) {
-  std::vector<std::string> texts;
-  if (!array) return texts;
-  for (const Value& item : *array) {
-    if (const std::string* text = item.asString()) texts.push_back(*text);
-  }
-  return texts;
-}
-
-bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<std::string>& clientName,
+bool matchClientNameAndServiceID(const config::ClientEntry& entry,
+                                 const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID) {
-  return matchExactStringWithList(itemsBetweenCommas(entry.string("client")), clientName, true) &&
-         matchStringWithList(itemsBetweenCommas(entry.string("service")), serviceID, true);
+  return matchExactStringWithList(entry.client, clientName, true) &&
+         matchStringWithList(entry.service, serviceID, true);
 }
 
 }  // namespace veltrad::backends

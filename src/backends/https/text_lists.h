@@ -3,10 +3,9 @@
 
 #include <optional>
 #include <string>
-#include <string_view>
 #include <vector>
 
-#include "base/value.h"
+#include "config/client_entry.h"
 
 namespace veltrad::backends {
 
@@ -18,13 +17,9 @@ bool matchExactStringWithList(const std::vector<std::string>& list,
 bool matchStringWithList(const std::vector<std::string>& list, const std::optional<std::string>& wholeString,
                          bool whitelist);
 
-// The items between commas, untrimmed; a null text has none.
-std::vector<std::string> itemsBetweenCommas(const std::string* text);
-// The texts of an array; items of other types are left out.
-std::vector<std::string> textsOf(const Array* array);
-
 // An entry's "client" (exact) and "service" (substring); an entry without both matches every client.
-bool matchClientNameAndServiceID(const Dictionary& entry, const std::optional<std::string>& clientName,
+bool matchClientNameAndServiceID(const config::ClientEntry& entry,
+                                 const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID);
 
 }  // namespace veltrad::backends

@@ -16,10 +16,10 @@ bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
 }
 
 std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& services,
-                                                       const std::string& name, const Dictionary* profile,
+                                                       const std::string& name,
                                                        const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, profile, productFamily));
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(services, name, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -29,9 +29,9 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(const BackendServices& se
   return backend;
 }
 
-MivoBackend::MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
+MivoBackend::MivoBackend(const BackendServices& services, const std::string& name,
                          const std::string& productFamily)
-    : VeltraBackend(name, profile ? *profile : Dictionary{}, productFamily, services.random),
+    : VeltraBackend(name, productFamily, services.random),
       _counters(services.counters),
       _clientBundle(services.adaptorBundle) {}
 

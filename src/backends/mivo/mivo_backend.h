@@ -19,7 +19,6 @@ class MivoBackend final : public VeltraBackend {
  public:
   // Null for a client type that has no adaptor; one error line has said so.
   static std::shared_ptr<MivoBackend> initWithName(const BackendServices& services, const std::string& name,
-                                                   const Dictionary* profile,
                                                    const std::string& productFamily, std::int32_t clientType);
 
   static bool isClientTypeAllowed(std::int32_t clientType);
@@ -31,8 +30,7 @@ class MivoBackend final : public VeltraBackend {
                                          std::int32_t flag) override;
 
  private:
-  MivoBackend(const BackendServices& services, const std::string& name, const Dictionary* profile,
-              const std::string& productFamily);
+  MivoBackend(const BackendServices& services, const std::string& name, const std::string& productFamily);
   void loadAdaptor();
 
   // Constant after initialisation.

@@ -50,22 +50,21 @@ void sayUnreadable(const std::string& path, int error) {
 
 std::shared_ptr<UploadBackend> UploadBackend::initWithName(const BackendServices& services,
                                                            FileUploads& uploads, const std::string& name,
-                                                           const Dictionary* profile,
+                                                           const config::UploadProfile* profile,
                                                            const std::string& productFamily) {
-  const std::string* url = profile ? profile->string("post_url") : nullptr;
-  if (!url) {
+  if (!profile || !profile->postURL) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
     return nullptr;
   }
-  std::shared_ptr<UploadBackend> backend(new UploadBackend(services, uploads, name, *profile, productFamily));
-  backend->setUploadURL(*url);
-  if (const std::string* display = profile->string("display_url")) backend->setDisplayURL(*display);
+  std::shared_ptr<UploadBackend> backend(new UploadBackend(services, uploads, name, productFamily));
+  backend->setUploadURL(profile->postURL);
+  backend->setDisplayURL(profile->displayURL);
   return backend;
 }
 
 UploadBackend::UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
-                             const Dictionary& profile, const std::string& productFamily)
-    : VeltraBackend(name, profile, productFamily, services.random),
+                             const std::string& productFamily)
+    : VeltraBackend(name, productFamily, services.random),
       _uploads(uploads),
       _http(services.http),
       _counters(services.counters),

@@ -28,7 +28,8 @@ class UploadBackend final : public VeltraBackend {
   // From a storebag's section: "post_url" (without a query), and where given "display_url". Null, after one
   // error line, without the first.
   static std::shared_ptr<UploadBackend> initWithName(const BackendServices& services, FileUploads& uploads,
-                                                     const std::string& name, const Dictionary* profile,
+                                                     const std::string& name,
+                                                     const config::UploadProfile* profile,
                                                      const std::string& productFamily);
 
   // True when the request was carried out, whatever became of it: the answer alone decides whether the client
@@ -41,7 +42,7 @@ class UploadBackend final : public VeltraBackend {
 
  private:
   UploadBackend(const BackendServices& services, FileUploads& uploads, const std::string& name,
-                const Dictionary& profile, const std::string& productFamily);
+                const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;

@@ -18,8 +18,8 @@ std::optional<std::int64_t> fromHTTPDate(const std::string& text) {
   return ::timegm(&parts);
 }
 
-std::string bodyFor(const Dictionary& storebag, const SigningKey& key, Rule::Signature sign) {
-  if (sign == Rule::Signature::right) return makeStorebagContainer(key, storebag);
+std::string bodyFor(const Dictionary& storebag, const config::SigningKey& key, Rule::Signature sign) {
+  if (sign == Rule::Signature::right) return config::makeStorebagContainer(key, storebag);
   const std::string bag = formats::writeXMLPropertyList(storebag);
   if (sign == Rule::Signature::none) return bag;
   Dictionary container{{"bag", encodeBase64(bag)}};
@@ -41,8 +41,8 @@ std::string httpDate(std::int64_t secondsSince1970) {
   return std::string(text, std::strftime(text, sizeof text, kDateFormat, &parts));
 }
 
-Answer answerWithStorebag(const StorebagFile& file, const SigningKey& key, Rule::Signature sign, int maxAge,
-                          const std::string& ifModifiedSince) {
+Answer answerWithStorebag(const StorebagFile& file, const config::SigningKey& key, Rule::Signature sign,
+                          int maxAge, const std::string& ifModifiedSince) {
   Answer answer;
   answer.type = "application/x-plist";
   answer.headers.set("Last-Modified", httpDate(file.modified));

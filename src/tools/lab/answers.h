@@ -22,8 +22,8 @@ std::string httpDate(std::int64_t secondsSince1970);
 
 // The signed container, or 304 with nothing when the file is not newer than `ifModifiedSince` (empty: not
 // asked).
-Answer answerWithStorebag(const StorebagFile& file, const SigningKey& key, Rule::Signature sign, int maxAge,
-                          const std::string& ifModifiedSince);
+Answer answerWithStorebag(const StorebagFile& file, const config::SigningKey& key, Rule::Signature sign,
+                          int maxAge, const std::string& ifModifiedSince);
 // 404 or 500, with the reason as text.
 Answer answerWithFailure(const StorebagFailure& failure);
 // Status, body and headers as the rule says.

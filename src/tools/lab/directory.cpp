@@ -86,10 +86,11 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
 std::optional<std::string> makeSigningKey(const std::string& privatePath, const std::string& publicPath) {
   platform::DiskFileStore files;
   if (!exists(privatePath)) {
-    if (const auto written = files.replace(privatePath, SigningKey::generate().privatePEM(), 0600); !written)
+    if (const auto written = files.replace(privatePath, config::SigningKey::generate().privatePEM(), 0600);
+        !written)
       return written.error().description;
   }
-  const auto key = SigningKey::load(privatePath);
+  const auto key = config::SigningKey::load(privatePath);
   if (!key) return key.error();
   if (const auto written = files.replace(publicPath, key.value().publicDER(), 0644); !written)
     return written.error().description;
@@ -113,7 +114,7 @@ Result<Directory, std::string> Directory::open(const std::string& path) {
   const std::string privatePath = path + "/signing/private.pem";
   if (const auto failure = makeSigningKey(privatePath, path + "/signing/publicKey.der"))
     return Failure{*failure};
-  auto key = SigningKey::load(privatePath);
+  auto key = config::SigningKey::load(privatePath);
   if (!key) return Failure{key.error()};
   Directory directory(path, std::move(key).value());
   if (!exists(directory.certificatePath()) || !exists(directory.certificateKeyPath())) {

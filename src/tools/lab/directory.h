@@ -8,7 +8,7 @@
 
 #include "base/result.h"
 #include "base/value.h"
-#include "tools/storebag/signing.h"
+#include "config/storebag_signing.h"
 
 namespace veltrad::lab {
 
@@ -36,7 +36,7 @@ class Directory {
   std::string receivedPath(std::string_view kind) const {
     return _path + "/received/" + std::string(kind) + ".jsonl";
   }
-  const SigningKey& signingKey() const { return _signingKey; }
+  const config::SigningKey& signingKey() const { return _signingKey; }
 
   // NAME.plist, else NAME.json, read afresh; every "${url}" in its texts becomes `url`, and a text that is
   // "${dashboardPort}" the number.
@@ -44,11 +44,11 @@ class Directory {
                                                  int dashboardPort) const;
 
  private:
-  Directory(std::string path, SigningKey signingKey)
+  Directory(std::string path, config::SigningKey signingKey)
       : _path(std::move(path)), _signingKey(std::move(signingKey)) {}
 
   const std::string _path;
-  const SigningKey _signingKey;
+  const config::SigningKey _signingKey;
 };
 
 }  // namespace veltrad::lab

@@ -12,11 +12,11 @@
 
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
+#include "config/storebag_signing.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "storebag/lint.h"
-#include "storebag/signing.h"
 
 namespace veltrad::storebag {
 namespace {
@@ -110,7 +110,7 @@ Outcome keygen(const std::string& directory, int bits) {
   for (const std::string& path : {privatePath, publicPath})
     if (exists(path)) return refused(path + ": exists already; keys are never overwritten");
   if (const auto made = platform::makeDirectories(directory); !made) return refused(made.error().description);
-  const SigningKey key = SigningKey::generate(bits);
+  const config::SigningKey key = config::SigningKey::generate(bits);
   if (const auto failure = writeNew(privatePath, key.privatePEM(), 0600)) return refused(*failure);
   if (const auto failure = writeNew(publicPath, key.publicDER(), 0644)) {
     ::unlink(privatePath.c_str());
@@ -120,7 +120,7 @@ Outcome keygen(const std::string& directory, int bits) {
 }
 
 Outcome sign(const std::string& privateKey, const std::string& in, const std::string& out) {
-  const auto key = SigningKey::load(privateKey);
+  const auto key = config::SigningKey::load(privateKey);
   if (!key) return refused(key.error());
   const auto bag = readBag(in);
   if (!bag) return refused(bag.error());
@@ -128,7 +128,7 @@ Outcome sign(const std::string& privateKey, const std::string& in, const std::st
     return refused(in + ": the storebag is no dictionary at its top level");
   if (!config::parseStorebagBag(bag.value().bytes))
     return refused(fmt::format("{}: beyond what the daemon takes of a storebag: {}", in, bounds()));
-  const std::string container = makeStorebagContainerAround(key.value(), bag.value().bytes);
+  const std::string container = config::makeStorebagContainerAround(key.value(), bag.value().bytes);
   if (!config::parseStorebagContainer(container))
     return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", in, container.size(),
                                config::kStorebagMostContainerBytes));

@@ -4,94 +4,49 @@
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <initializer_list>
+#include <iterator>
 
 #include "base/text.h"
-#include "config/client_types.h"
+#include "config/storebag_content.h"
 #include "formats/json.h"
-#include "wire/constants.h"
 
-namespace veltrad {
+namespace veltrad::storebag {
 namespace {
 
-enum class Kind { text, number, texts, array, dictionary, anything };
-
-struct Key {
-  const char* name;
-  Kind kind;
-};
-using Keys = std::initializer_list<Key>;
-
-constexpr Keys kStorebagKeys = {{"development", Kind::dictionary}, {"florn_internal", Kind::dictionary},
-                                {"seed", Kind::dictionary},        {"release", Kind::dictionary},
-                                {"version", Kind::text},           {"refresh_cycle", Kind::number}};
-constexpr Keys kBackends = {
-    {wire::kVeltraBackendDashboard, Kind::dictionary}, {wire::kVeltraBackendUploadServer, Kind::dictionary},
-    {wire::kVeltraBackendHTTPPost, Kind::dictionary},  {wire::kVeltraBackendHTTPPost2, Kind::dictionary},
-    {wire::kVeltraBackendAmpery, Kind::dictionary},    {wire::kVeltraBackendMivo, Kind::dictionary}};
-constexpr Keys kHTTPSPostKeys = {{"clients", Kind::array}, {"display_url", Kind::text}};
-constexpr Keys kUploadKeys = {{"post_url", Kind::text}, {"display_url", Kind::text}};
-constexpr Keys kEntryKeys = {{"client", Kind::text},
-                             {"service", Kind::text},
-                             {"expedite", Kind::number},
-                             {"hierarchy", Kind::number},
-                             {"override_dnu", Kind::number},
-                             {"locale_whitelist", Kind::texts},
-                             {"device_whitelist", Kind::texts},
-                             {"device_blacklist", Kind::texts},
-                             {"filters", Kind::array},
-                             {"sampling_threshold", Kind::number},
-                             {"per_country_sampling_thresholds", Kind::array},
-                             {"override_sampling", Kind::number},
-                             {"event_threshold", Kind::number},
-                             {"extras_on_internal", Kind::number},
-                             {"custom_clientId", Kind::anything},
-                             {"post_url", Kind::text},
-                             {"realtime_post_url", Kind::text}};
-constexpr Keys kFilterKeys = {
-    {"key", Kind::text}, {"action", Kind::text}, {"method", Kind::number}, {"status", Kind::number}};
-constexpr Keys kCountryKeys = {{"country", Kind::texts}, {"threshold", Kind::number}};
+using config::Key;
+using config::KeyTable;
+using config::KeyType;
 
 constexpr const char* kNobody = "refuses every client that requires user info";
 
-const char* nameOf(Kind kind) {
-  switch (kind) {
-    case Kind::text:
+const char* nameOf(KeyType type) {
+  switch (type) {
+    case KeyType::text:
+    case KeyType::url:
+    case KeyType::names:
       return "a text";
-    case Kind::number:
+    case KeyType::integer:
+    case KeyType::real:
       return "a number";
-    case Kind::texts:
+    case KeyType::texts:
       return "an array of texts";
-    case Kind::array:
+    case KeyType::dictionaries:
       return "an array";
-    case Kind::dictionary:
+    case KeyType::dictionary:
       return "a dictionary";
-    case Kind::anything:
+    case KeyType::presence:
       break;
   }
   return "anything";
 }
 
-bool fits(const Value& value, Kind kind) {
-  switch (kind) {
-    case Kind::text:
-      return value.asString() != nullptr;
-    case Kind::number:
-      return value.toDouble().has_value();
-    case Kind::texts:
-    case Kind::array:
-      return value.asArray() != nullptr;
-    case Kind::dictionary:
-      return value.asDictionary() != nullptr;
-    case Kind::anything:
-      break;
-  }
-  return true;
+bool holdsText(const Array& array) {
+  return std::any_of(array.begin(), array.end(), [](const Value& item) { return item.asString(); });
 }
 
-bool holdsText(const Array* array) {
-  return array != nullptr &&
-         std::any_of(array->begin(), array->end(), [](const Value& item) { return item.asString(); });
+bool outside(const config::Range& range, const Value& number) {
+  const double read = number.toDouble().value_or(0);
+  return range.least < range.most && (read < range.least || read > range.most);
 }
 
 std::string quoted(const std::string& text) {
@@ -102,115 +57,111 @@ std::string quoted(const std::string& text) {
 class Lint {
  public:
   void checkStorebag(const Dictionary& storebag) {
-    checkKeys("storebag", "section or key", storebag, kStorebagKeys);
-    if (!storebag.contains("version")) say("storebag", "no \"version\": events do not say which they follow");
-    if (!storebag.contains("release"))
-      say("storebag",
-          "no \"release\": most devices get nothing, and those of \"seed\" have nothing to fall back on");
-    for (std::uint32_t environment = 1; const char* name = config::sectionNameForEnvironment(environment);
-         ++environment)
-      if (const Dictionary* section = storebag.dictionary(name)) checkSection(name, *section);
+    check("storebag", "section or key", storebag, config::Storebag::kKeys);
   }
   std::vector<std::string> take() { return std::move(_findings); }
 
  private:
   void say(const std::string& place, const std::string& what) { _findings.push_back(place + ": " + what); }
 
-  void checkKeys(const std::string& place, const char* what, const Dictionary& dictionary, Keys known) {
-    for (const Dictionary::Entry& entry : dictionary) {
-      const auto& name = entry.first;
-      const Value& value = entry.second;
-      const auto key = std::find_if(known.begin(), known.end(), [&](const Key& k) { return name == k.name; });
-      if (key == known.end()) {
-        std::string expected;
-        for (const Key& k : known) expected += (expected.empty() ? "" : ", ") + std::string(k.name);
-        say(place, fmt::format("unknown {} {}: expected one of {}", what, quoted(name), expected));
-      } else if (!fits(value, key->kind)) {
-        say(place, fmt::format("{} is not {}: counts as absent", quoted(name), nameOf(key->kind)));
-      } else if (key->kind == Kind::texts) {
-        for (const Value& item : *value.asArray())
-          if (!item.asString())
-            say(place, fmt::format("{} holds {}, which is no text", quoted(name), formats::writeJSON(item)));
-      }
-    }
-  }
-
-  // The array's dictionaries, by their places; what is none is said.
-  template <typename Check>
-  void forEach(const std::string& place, const Array* array, Check check) {
-    for (std::size_t i = 0; array != nullptr && i < array->size(); ++i) {
-      const std::string at = fmt::format("{}[{}]", place, i);
-      if (const Dictionary* element = (*array)[i].asDictionary())
-        check(at, *element);
+  void check(const std::string& place, const char* what, const Dictionary& dictionary,
+             const KeyTable& table) {
+    for (const auto& [name, value] : dictionary) {
+      if (const Key* key = table.find(name))
+        checkValue(place, *key, value);
       else
-        say(at, "is not a dictionary: passed over");
+        sayUnknown(place, what, name, table);
+    }
+    for (const Key& key : table)
+      if (key.need == config::Need::required) checkRequired(place, key, dictionary.find(key.name));
+    checkWhole(place, dictionary, table);
+    for (const Key& key : table) {
+      const Value* value = key.inner != nullptr ? dictionary.find(key.name) : nullptr;
+      if (value == nullptr) continue;
+      const bool isSection = &table == &config::Storebag::kKeys;
+      const std::string at = isSection ? key.name : place + "." + key.name;
+      if (const Dictionary* inner = value->asDictionary(); inner && key.type == KeyType::dictionary)
+        check(at, isSection ? "back end" : "key", *inner, *key.inner);
+      else if (const Array* elements = value->asArray(); elements && key.type == KeyType::dictionaries)
+        checkElements(at, *elements, *key.inner);
     }
   }
 
-  void checkSection(const std::string& place, const Dictionary& section) {
-    checkKeys(place, "back end", section, kBackends);
-    for (const char* name : {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2})
-      if (const Dictionary* profile = section.dictionary(name)) checkClients(place + "." + name, *profile);
-    if (const Dictionary* profile = section.dictionary(wire::kVeltraBackendUploadServer))
-      checkUploads(place + "." + wire::kVeltraBackendUploadServer, *profile);
+  void sayUnknown(const std::string& place, const char* what, const std::string& name,
+                  const KeyTable& table) {
+    std::string expected;
+    for (const Key& key : table) expected += (expected.empty() ? "" : ", ") + std::string(key.name);
+    say(place, fmt::format("unknown {} {}: expected one of {}", what, quoted(name), expected));
   }
 
-  void checkUploads(const std::string& place, const Dictionary& profile) {
-    checkKeys(place, "key", profile, kUploadKeys);
-    if (!profile.string("post_url")) say(place, "no \"post_url\": the back end is left out");
-    checkURL(place, profile, "post_url");
+  void checkValue(const std::string& place, const Key& key, const Value& value) {
+    const std::string name = quoted(key.name);
+    if (!config::fits(value, key.type))
+      return say(place, fmt::format("{} is not {}: counts as absent", name, nameOf(key.type)));
+    if (key.type == KeyType::texts) {
+      for (const Value& item : *value.asArray())
+        if (!item.asString())
+          say(place, fmt::format("{} holds {}, which is no text", name, formats::writeJSON(item)));
+    } else if (key.type == KeyType::url && !lowerCase(*value.asString()).starts_with("https://")) {
+      say(place, fmt::format("{} does not begin with https://: nothing is posted to {}", name,
+                             quoted(*value.asString())));
+    } else if ((key.type == KeyType::integer || key.type == KeyType::real) && outside(key.range, value)) {
+      say(place, fmt::format("{} is {}: expected {:.0f} to {:.0f}", name, formats::writeJSON(value),
+                             key.range.least, key.range.most));
+    }
   }
 
-  void checkURL(const std::string& place, const Dictionary& dictionary, const char* key) {
-    const std::string* url = dictionary.string(key);
-    if (url != nullptr && lowerCase(*url).rfind("https://", 0) != 0)
-      say(place,
-          fmt::format("\"{}\" does not begin with https://: nothing is posted to {}", key, quoted(*url)));
+  void checkRequired(const std::string& place, const Key& key, const Value* value) {
+    const bool given = value != nullptr && config::fits(*value, key.type);
+    if (key.type == KeyType::texts) {  // both such lists are of countries
+      if (!given || !holdsText(*value->asArray()))
+        say(place, fmt::format("no country in \"{}\": {}", key.name, key.byDefault));
+    } else if (!given) {
+      say(place, fmt::format("no \"{}\": {}", key.name, key.byDefault));
+    }
   }
 
-  void checkClients(const std::string& place, const Dictionary& profile) {
-    checkKeys(place, "key", profile, kHTTPSPostKeys);
-    const Array* clients = profile.array("clients");
-    if (clients == nullptr) return say(place, "no \"clients\": the back end is left out");
-    if (clients->empty())
-      say(place, fmt::format("\"clients\" is empty: {}, and has no URL for the others", kNobody));
-    std::string everyones;  // the place of the first entry that matches everyone
-    forEach(place + ".clients", clients, [&](const std::string& at, const Dictionary& entry) {
+  // What no key says alone.
+  void checkWhole(const std::string& place, const Dictionary& dictionary, const KeyTable& table) {
+    if (&table == &config::HTTPSPostProfile::kKeys) {
+      const Array* clients = dictionary.array("clients");
+      if (clients != nullptr && clients->empty())
+        say(place, fmt::format("\"clients\" is empty: {}, and has no URL for the others", kNobody));
+    } else if (&table == &config::ClientEntry::kKeys) {
+      const Array* countries = dictionary.array("per_country_sampling_thresholds");
+      if (!dictionary.real("sampling_threshold") && (countries == nullptr || countries->empty()))
+        say(place, fmt::format("no \"sampling_threshold\", not even for a country: {}", kNobody));
+    } else if (&table == &config::filterTag::kKeys) {
+      checkAction(place, dictionary.string("action"));
+    }
+  }
+
+  void checkAction(const std::string& place, const std::string* action) {
+    const auto isNamed = [action](const auto& known) { return *action == known.first; };
+    if (action == nullptr ||
+        std::any_of(std::begin(config::kFilterActions), std::end(config::kFilterActions), isNamed))
+      return;
+    say(place,
+        fmt::format("unknown \"action\" {}: the field is kept; expected remove or sha256", quoted(*action)));
+  }
+
+  void checkElements(const std::string& place, const Array& elements, const KeyTable& table) {
+    std::string everyones;  // the place of the first client entry that matches everyone
+    for (std::size_t i = 0; i < elements.size(); ++i) {
+      const std::string at = fmt::format("{}[{}]", place, i);
+      const Dictionary* element = elements[i].asDictionary();
+      if (element == nullptr) {
+        say(at, "is not a dictionary: passed over");
+        continue;
+      }
       if (!everyones.empty())
         say(at,
             fmt::format("never used for a client that requires user info: {} matches everyone", everyones));
-      else if (!entry.string("client") && !entry.string("service"))
+      else if (&table == &config::ClientEntry::kKeys && !element->string("client") &&
+               !element->string("service"))
         everyones = at;
-      checkEntry(at, entry);
-    });
-  }
-
-  void checkEntry(const std::string& place, const Dictionary& entry) {
-    checkKeys(place, "key", entry, kEntryKeys);
-    const Array* countries = entry.array("per_country_sampling_thresholds");
-    if (!holdsText(entry.array("locale_whitelist")))
-      say(place, fmt::format("no country in \"locale_whitelist\": {}", kNobody));
-    if (!entry.array("filters")) say(place, fmt::format("no \"filters\": {}", kNobody));
-    if (!entry.real("sampling_threshold") && (countries == nullptr || countries->empty()))
-      say(place, fmt::format("no \"sampling_threshold\", not even for a country: {}", kNobody));
-    if (!entry.string("post_url")) say(place, "no \"post_url\": nothing can be posted");
-    for (const char* key : {"post_url", "realtime_post_url"}) checkURL(place, entry, key);
-    forEach(place + ".filters", entry.array("filters"),
-            [this](const std::string& at, const Dictionary& filter) {
-              checkKeys(at, "key", filter, kFilterKeys);
-              if (!filter.string("key")) say(at, "no \"key\": matches nothing");
-              const std::string* action = filter.string("action");
-              if (action != nullptr && *action != "remove" && *action != "sha256")
-                say(at, fmt::format("unknown \"action\" {}: the field is kept; expected remove or sha256",
-                                    quoted(*action)));
-            });
-    forEach(place + ".per_country_sampling_thresholds", countries,
-            [this](const std::string& at, const Dictionary& country) {
-              checkKeys(at, "key", country, kCountryKeys);
-              if (!holdsText(country.array("country"))) say(at, "no country in \"country\": never used");
-              if (!country.real("threshold"))
-                say(at, "no \"threshold\": in these countries it " + std::string(kNobody));
-            });
+      check(at, "key", *element, table);
+    }
   }
 
   std::vector<std::string> _findings;
@@ -224,4 +175,4 @@ std::vector<std::string> lintStorebag(const Dictionary& storebag) {
   return lint.take();
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::storebag

@@ -6,12 +6,12 @@
 #include <exception>
 #include <string>
 
+#include "config/storebag_signing.h"
 #include "storebag/commands.h"
-#include "storebag/signing.h"
 
 namespace {
 
-using veltrad::SigningKey;
+using veltrad::config::SigningKey;
 using veltrad::storebag::Outcome;
 
 struct Arguments {

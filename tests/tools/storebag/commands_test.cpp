@@ -9,10 +9,10 @@
 
 #include "base/base64.h"
 #include "config/storebag_container.h"
+#include "config/storebag_signing.h"
 #include "fakes/temporary_directory.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
-#include "storebag/signing.h"
 
 namespace veltrad {
 namespace {
@@ -26,7 +26,7 @@ const Dictionary kStorebag{{"release", Dictionary{{"mivo", Dictionary{{"active",
 class StorebagCommands : public testing::Test {
  protected:
   StorebagCommands() {
-    const Outcome made = storebag::keygen(path("keys"), SigningKey::kFewestBits);
+    const Outcome made = storebag::keygen(path("keys"), config::SigningKey::kFewestBits);
     EXPECT_EQ(made.text, privateKey + "\n" + publicKey + "\n");
   }
   std::string path(const std::string& name) const { return _directory.path(name); }
@@ -51,7 +51,7 @@ TEST_F(StorebagCommands, KeygenMakesAPairAndNeverOverwritesOne) {
   EXPECT_EQ(std::filesystem::status(privateKey).permissions(), std::filesystem::perms(0600));
   const std::string pem = read("keys/privateKey.pem");
   std::filesystem::remove(publicKey);
-  EXPECT_THAT(refusal(storebag::keygen(path("keys"), SigningKey::kFewestBits)),
+  EXPECT_THAT(refusal(storebag::keygen(path("keys"), config::SigningKey::kFewestBits)),
               HasSubstr(privateKey + ": exists already"));
   EXPECT_EQ(read("keys/privateKey.pem"), pem);
   EXPECT_FALSE(std::filesystem::exists(publicKey));
@@ -101,7 +101,7 @@ TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
 }
 
 TEST_F(StorebagCommands, VerifyNamesTheStepThatFails) {
-  const auto key = SigningKey::load(privateKey);
+  const auto key = config::SigningKey::load(privateKey);
   ASSERT_TRUE(key);
   const std::string bag = formats::writeXMLPropertyList(kStorebag), bagText = encodeBase64(bag);
   const std::string signature = encodeBase64(key.value().sign(bag));
@@ -112,11 +112,12 @@ TEST_F(StorebagCommands, VerifyNamesTheStepThatFails) {
       {list({{"signature", "a"}, {"bag", "a"}}), "no base64"},
       {list({{"signature", "c2ln"}, {"bag", bagText}}), "the signature has 3 bytes; one of this key has 256"},
       {list({{"signature", signature}, {"bag", encodeBase64("other")}}), "not this key's over this bag"},
-      {makeStorebagContainerAround(key.value(), "no list"), "the bag is no property list of a dictionary"},
+      {config::makeStorebagContainerAround(key.value(), "no list"),
+       "the bag is no property list of a dictionary"},
   };
   for (const auto& [bytes, reason] : files)
     EXPECT_THAT(refusal(storebag::verify(publicKey, file("signed", bytes))), HasSubstr(reason));
-  const std::string good = file("good", makeStorebagContainer(key.value(), kStorebag));
+  const std::string good = file("good", config::makeStorebagContainer(key.value(), kStorebag));
   EXPECT_TRUE(storebag::verify(publicKey, good).done);
   EXPECT_THAT(refusal(storebag::verify(privateKey, good)), HasSubstr("in DER form of 2048 to 8192 bits"));
 }

@@ -1,4 +1,4 @@
-// Keys that sign storebags, and the container that carries a signed one. For the tools; any thread.
+// Keys that sign storebags, and the container that carries a signed one. The daemon never signs; any thread.
 #pragma once
 
 #include <memory>
@@ -10,7 +10,7 @@
 
 struct evp_pkey_st;
 
-namespace veltrad {
+namespace veltrad::config {
 
 // An RSA private key; copies share it. Signs with PKCS#1 v1.5 over SHA-1, which is what the daemon verifies.
 class SigningKey {
@@ -40,4 +40,4 @@ std::string makeStorebagContainer(const SigningKey& key, const Dictionary& store
 // The same around bag bytes as they are.
 std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag);
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -1,5 +1,5 @@
 // Keys that sign storebags. Any thread.
-#include "storebag/signing.h"
+#include "config/storebag_signing.h"
 
 #include <openssl/bio.h>
 #include <openssl/evp.h>
@@ -14,7 +14,7 @@
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 
-namespace veltrad {
+namespace veltrad::config {
 namespace {
 
 using Key = std::shared_ptr<EVP_PKEY>;
@@ -102,4 +102,4 @@ std::string makeStorebagContainerAround(const SigningKey& key, std::string_view 
       Dictionary{{"signature", encodeBase64(key.sign(bag))}, {"bag", encodeBase64(bag)}});
 }
 
-}  // namespace veltrad
+}  // namespace veltrad::config

@@ -1,0 +1,82 @@
+// What a storebag says, parsed once when it is taken in: its top level, the section of an environment, and
+// what each back end reads of it. Immutable; sessions share it; any thread.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "config/client_entry.h"
+#include "config/key_table.h"
+
+namespace veltrad::config {
+
+// Of "httppost" and "httppost2".
+struct HTTPSPostProfile {
+  std::optional<std::vector<ClientEntry>> clients;
+  std::optional<std::string> displayURL;
+
+  bool operator==(const HTTPSPostProfile&) const = default;
+  static const KeyTable kKeys;
+};
+
+// "reliable": there with any value, it switches acknowledgements on.
+struct Reliable {
+  bool on = false;
+  std::int32_t milliseconds = 0;
+
+  bool operator==(const Reliable&) const = default;
+};
+void take(const Key& key, const Value& value, Reliable& field);
+
+// Of "dashboard".
+struct DashboardProfile {
+  std::optional<std::string> ip;
+  std::optional<std::uint16_t> port;
+  std::optional<std::string> displayURL;
+  std::optional<std::string> postURL;
+  Reliable reliable;
+
+  bool operator==(const DashboardProfile&) const = default;
+  static const KeyTable kKeys;
+};
+
+// Of "uploadserver".
+struct UploadProfile {
+  std::optional<std::string> postURL;
+  std::optional<std::string> displayURL;
+
+  bool operator==(const UploadProfile&) const = default;
+  static const KeyTable kKeys;
+};
+
+using Profile = std::variant<HTTPSPostProfile, DashboardProfile, UploadProfile>;
+
+// The back ends of one environment.
+struct StorebagSection {
+  Dictionary asGiven;
+  // Every entry by its name, known or not. Null: what its back end reads of it is nothing.
+  std::map<std::string, std::shared_ptr<const Profile>> backends;
+
+  static const KeyTable kKeys;
+};
+
+std::shared_ptr<const StorebagSection> parseSection(const Dictionary& section);
+
+struct Storebag {
+  std::optional<Dictionary> development;
+  std::optional<Dictionary> flornInternal;
+  std::optional<Dictionary> seed;
+  std::optional<Dictionary> release;
+  std::optional<std::string> version;
+  std::optional<std::int64_t> refreshCycle;  // seconds; within 32 bits
+
+  bool operator==(const Storebag&) const = default;
+  static const KeyTable kKeys;
+};
+
+}  // namespace veltrad::config
