@@ -17,6 +17,7 @@
 #include "ipc/socket_connection.h"
 #include "platform/file_store.h"
 #include "wire/frame.h"
+#include "wire/names.h"
 
 namespace {
 
@@ -58,8 +59,10 @@ std::string callFrame(std::uint32_t id) {
   for (int i = 0; i < 8; ++i) payload.set(fmt::format("field{}", i), fmt::format("value number {}", i));
   payload.set("seconds", 12.5);
   payload.set("count", 42);
-  Dictionary body{{"op", "sendMessageWithCategory:type:payload:reply:"}};
-  body.set("args", Dictionary{{"category", 5}, {"type", 1}, {"payload", std::move(payload)}});
+  Dictionary body{{wire::key::kOperation, wire::operation::kSendMessage}};
+  body.set(wire::key::kArguments,
+           Dictionary{
+               {wire::key::kCategory, 5}, {wire::key::kType, 1}, {wire::key::kPayload, std::move(payload)}});
   return wire::makeFrame(wire::FrameKind::call, id, std::move(body));
 }
 

@@ -10,6 +10,7 @@
 #include <string>
 #include <string_view>
 
+#include "backends/lock_ranks.h"
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
@@ -145,7 +146,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::atomic<std::int32_t> _hierarchy{0};
   std::atomic<bool> _batchEvents{false};
 
-  mutable Mutex _propertyMutex BACKEND_LOCK{LockRank::backend};
+  mutable Mutex _propertyMutex BACKEND_LOCK;
   SharedDictionary _userInfoDict GUARDED_BY(_propertyMutex);
   std::optional<std::string> _combinedSessionIDString GUARDED_BY(_propertyMutex);
   std::optional<std::string> _displayURL GUARDED_BY(_propertyMutex);

@@ -27,39 +27,35 @@
 namespace veltrad {
 
 // The place of a lock in the order: a thread takes only locks of a higher rank than the highest it holds.
-// Leaves have the highest rank and take nothing further.
-enum class LockRank : int {
-  sessionList = 10,
-  agent = 20,
-  flushCounters = 30,
-  session = 40,
-  backend = 50,
-  leaf = 100,
-  memory = 102,  // of those who wait for memory, which is paid back under any lock
-};
+// Ranks are numbers; the room that owns a lock gives its rank a name. Leaves take nothing further, but for
+// those of a rank above theirs.
+enum class LockRank : int { leaf = 100 };
 
-// The same order for the compiler: each level stands between two ranks, and a lock of a rank says on which
-// side of them it lies. Clang's -Wthread-safety-beta then refuses a function that takes two locks in the
-// wrong order.
+// The same order for the compiler: two levels stand around each multiple of ten, and a lock of that rank lies
+// between them, a leaf above them all. Clang's -Wthread-safety-beta then refuses a function that takes two
+// locks in the wrong order.
 namespace lock_order {
 class CAPABILITY("lock level") Level {};
-inline Level belowSessionList;
-inline Level belowAgent ACQUIRED_AFTER(belowSessionList);
-inline Level belowFlushCounters ACQUIRED_AFTER(belowAgent);
-inline Level belowSession ACQUIRED_AFTER(belowFlushCounters);
-inline Level belowBackend ACQUIRED_AFTER(belowSession);
+inline Level above0;
+#define LOCK_LEVELS(rank, last)                         \
+  inline Level below##rank ACQUIRED_AFTER(above##last); \
+  inline Level above##rank ACQUIRED_AFTER(below##rank)
+LOCK_LEVELS(10, 0);
+LOCK_LEVELS(20, 10);
+LOCK_LEVELS(30, 20);
+LOCK_LEVELS(40, 30);
+LOCK_LEVELS(50, 40);
+LOCK_LEVELS(60, 50);
+#undef LOCK_LEVELS
 }  // namespace lock_order
-#define SESSION_LIST_LOCK ACQUIRED_BEFORE(::veltrad::lock_order::belowSessionList)
-#define AGENT_LOCK \
-  ACQUIRED_AFTER(::veltrad::lock_order::belowSessionList) ACQUIRED_BEFORE(::veltrad::lock_order::belowAgent)
-#define FLUSH_COUNTERS_LOCK \
-  ACQUIRED_AFTER(::veltrad::lock_order::belowAgent) ACQUIRED_BEFORE(::veltrad::lock_order::belowFlushCounters)
-#define SESSION_LOCK                                        \
-  ACQUIRED_AFTER(::veltrad::lock_order::belowFlushCounters) \
-  ACQUIRED_BEFORE(::veltrad::lock_order::belowSession)
-#define BACKEND_LOCK \
-  ACQUIRED_AFTER(::veltrad::lock_order::belowSession) ACQUIRED_BEFORE(::veltrad::lock_order::belowBackend)
-#define LEAF_LOCK ACQUIRED_AFTER(::veltrad::lock_order::belowBackend)
+
+// Behind the name of a lock: `Mutex _mutex LOCK_OF_RANK(20);` and `Mutex _mutex LEAF_LOCK{LockRank::leaf};`.
+#define LOCK_OF_RANK(rank)                              \
+  ACQUIRED_AFTER(::veltrad::lock_order::below##rank)    \
+  ACQUIRED_BEFORE(::veltrad::lock_order::above##rank) { \
+    static_cast<::veltrad::LockRank>(rank)              \
+  }
+#define LEAF_LOCK ACQUIRED_AFTER(::veltrad::lock_order::above60)
 
 namespace lock_order {
 // Debug builds: aborts with both ranks when `rank` may not be taken now. Release builds: nothing.

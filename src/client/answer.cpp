@@ -5,28 +5,19 @@
 #include "base/version.h"
 #include "wire/constants.h"
 #include "wire/limits.h"
+#include "wire/names.h"
 
 namespace veltrad::client {
 
-namespace {
+namespace key = wire::key;
 
-// The daemon's own words for a callback that was let go without being called.
-constexpr std::string_view kNoReplyDescription = "The daemon gave no reply.";
+namespace {
 
 Answer unreadable() {
   return answerOfStatus(VELTRA_NO_REPLY, "The daemon's reply could not be read.");
 }
 
 }  // namespace
-
-wire::ReportingError errorOfDictionary(const Dictionary& dictionary) {
-  wire::ReportingError error;
-  if (const std::string* domain = dictionary.string("domain")) error.domain = *domain;
-  const Value* code = dictionary.find("code");
-  error.code = code ? code->toInt64().value_or(-1) : -1;
-  if (const std::string* description = dictionary.string("description")) error.description = *description;
-  return error;
-}
 
 Answer answerOfStatus(veltra_status status, const char* description) {
   auto answer = std::make_unique<veltra_reply>();
@@ -43,18 +34,20 @@ Answer answerOfReply(std::string_view body) {
   const Dictionary* reply = parsed ? parsed.value().asDictionary() : nullptr;
   if (!reply) return unreadable();
   auto answer = std::make_unique<veltra_reply>();
-  if (const Dictionary* error = reply->dictionary("error")) {
-    answer->error = errorOfDictionary(*error);
-    answer->status = answer->error->description == kNoReplyDescription ? VELTRA_NO_REPLY : VELTRA_REFUSED;
+  if (const Dictionary* error = reply->dictionary(key::kError)) {
+    answer->error = wire::errorOfDictionary(*error);
+    answer->status =
+        answer->error->description == wire::kNoReplyDescription ? VELTRA_NO_REPLY : VELTRA_REFUSED;
     return answer;
   }
-  const Dictionary* results = reply->dictionary("results");
+  const Dictionary* results = reply->dictionary(key::kResults);
   if (!results) return unreadable();
-  if (const std::string* text = results->string("reply")) answer->text = *text;
-  const Value* backends = results->find("backends");
+  if (const std::string* text = results->string(key::kReply)) answer->text = *text;
+  const Value* backends = results->find(key::kBackends);
   if (backends && backends->asArray()) answer->backends = nodeOfValue(*backends);
-  answer->uploaded = results->boolean("uploaded").value_or(false);
-  if (const Dictionary* error = results->dictionary("error")) answer->error = errorOfDictionary(*error);
+  answer->uploaded = results->boolean(key::kUploaded).value_or(false);
+  if (const Dictionary* error = results->dictionary(key::kError))
+    answer->error = wire::errorOfDictionary(*error);
   return answer;
 }
 

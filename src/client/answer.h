@@ -34,7 +34,5 @@ Answer answerOfStatus(veltra_status status, const char* description = nullptr);
 // What an upload's answer means for its file: removes it where the daemon has asked for that, and says why it
 // stays or was not taken. For any other answer nothing.
 void settleUpload(veltra_reply& answer);
-// {"domain", "code", "description"} as the wire carries it; what is missing or of another type is empty.
-wire::ReportingError errorOfDictionary(const Dictionary& dictionary);
 
 }  // namespace veltrad::client

@@ -6,8 +6,13 @@
 #include "wire/constants.h"
 #include "wire/frame.h"
 #include "wire/limits.h"
+#include "wire/names.h"
 
 namespace veltrad::client {
+
+namespace event = wire::event;
+namespace key = wire::key;
+namespace operation = wire::operation;
 
 namespace {
 
@@ -44,12 +49,12 @@ Value sessionInfo(const veltra_session_options& options) {
 // Session info, and user info where there is any.
 Entries identity(const veltra_session_options& options) {
   Entries arguments;
-  arguments.emplace_back("sessionInfo", sessionInfo(options));
+  arguments.emplace_back(key::kSessionInfo, sessionInfo(options));
   if (options.user_info || options.client_name || options.service_name) {
     Dictionary userInfo = dictionaryOfNode(options.user_info);
     if (options.client_name) userInfo.set(wire::kVeltraUserInfoClientName, mended(options.client_name));
     if (options.service_name) userInfo.set(wire::kVeltraUserInfoServiceName, mended(options.service_name));
-    arguments.emplace_back("userInfo", std::move(userInfo));
+    arguments.emplace_back(key::kUserInfo, std::move(userInfo));
   }
   return arguments;
 }
@@ -58,8 +63,8 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
                       std::uint8_t descriptors = 0) {
   Entries body;
   body.reserve(2);
-  body.emplace_back("args", Dictionary::fromEntries(std::move(arguments)));
-  body.emplace_back("op", operation);
+  body.emplace_back(key::kArguments, Dictionary::fromEntries(std::move(arguments)));
+  body.emplace_back(key::kOperation, operation);
   Dictionary whole = Dictionary::fromEntries(std::move(body));
   std::string frame = wire::makeFrame(kind, 0, whole, descriptors);
   if (!wire::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
@@ -68,6 +73,15 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
     return {VELTRA_TOO_LARGE, {}};
   }
   return {VELTRA_OK, std::move(frame)};
+}
+
+// A call whose one argument is a dictionary; left out where it is null.
+CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary) {
+  if (!absentOrDictionary(dictionary)) return {VELTRA_INVALID, {}};
+  if (!fits(dictionary)) return {VELTRA_TOO_LARGE, {}};
+  Entries arguments;
+  if (dictionary) arguments.emplace_back(argument, dictionaryOfNode(dictionary));
+  return callFrame(operation, std::move(arguments));
 }
 
 }  // namespace
@@ -86,28 +100,27 @@ CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_
   if (flag != 0) message.emplace_back(wire::kVeltraMessageParametersFlag, flag);
   if (payload) message.emplace_back(wire::kVeltraMessageParametersPayload, dictionaryOfNode(payload));
   message.emplace_back(wire::kVeltraMessageParametersType, static_cast<unsigned>(type));
-  if (flag == 0) return callFrame(kSendMessage, std::move(message));
+  if (flag == 0) return callFrame(operation::kSendMessage, std::move(message));
   Entries arguments;
-  arguments.emplace_back("message", Dictionary::fromEntries(std::move(message)));
-  return callFrame(kSendDictionary, std::move(arguments));
+  arguments.emplace_back(key::kMessage, Dictionary::fromEntries(std::move(message)));
+  return callFrame(operation::kSendDictionary, std::move(arguments));
 }
 
-CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary,
-                          Missing missing) {
-  if (!absentOrDictionary(dictionary) || (!dictionary && missing == Missing::invalid))
-    return {VELTRA_INVALID, {}};
-  if (!fits(dictionary)) return {VELTRA_TOO_LARGE, {}};
-  Entries arguments;
-  if (dictionary) arguments.emplace_back(argument, dictionaryOfNode(dictionary));
-  return callFrame(operation, std::move(arguments));
+CallFrame messageDictionaryFrame(const veltra_value* message) {
+  if (!message) return {VELTRA_INVALID, {}};
+  return dictionaryFrame(operation::kSendDictionary, key::kMessage, message);
+}
+
+CallFrame statesFrame(const veltra_value* userInfo) {
+  return dictionaryFrame(operation::kFetchStates, key::kUserInfo, userInfo);
 }
 
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
   if (!absentOrDictionary(options.user_info)) return {VELTRA_INVALID, {}};
   if (!fits(options.user_info)) return {VELTRA_TOO_LARGE, {}};
   Entries arguments = identity(options);
-  arguments.emplace_back("hasAggregationBlock", options.aggregated != nullptr);
-  return callFrame(kSetSessionInfo, std::move(arguments));
+  arguments.emplace_back(key::kHasAggregationBlock, options.aggregated != nullptr);
+  return callFrame(operation::kSetSessionInfo, std::move(arguments));
 }
 
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
@@ -115,32 +128,33 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
   if (!absentOrDictionary(who.user_info) || !absentOrDictionary(payload)) return {VELTRA_INVALID, {}};
   if (!fits(who.user_info) || !fits(payload)) return {VELTRA_TOO_LARGE, {}};
   Entries arguments = identity(who);
-  arguments.emplace_back("category", static_cast<unsigned>(category));
-  if (payload) arguments.emplace_back("payload", dictionaryOfNode(payload));
-  arguments.emplace_back("type", static_cast<unsigned>(type));
-  return callFrame(kSendOneShot, std::move(arguments));
+  arguments.emplace_back(key::kCategory, static_cast<unsigned>(category));
+  if (payload) arguments.emplace_back(key::kPayload, dictionaryOfNode(payload));
+  arguments.emplace_back(key::kType, static_cast<unsigned>(type));
+  return callFrame(operation::kSendOneShot, std::move(arguments));
 }
 
 CallFrame uploadFileFrame(const char* path) {
   if (!path) return {VELTRA_INVALID, {}};
   auto file = std::make_shared<UploadedFile>(path);
-  CallFrame call = frameOfKind(wire::FrameKind::call, kUploadFile, {{"path", toUTF8(file->absolutePath())}},
-                               file->descriptor() >= 0 ? 1 : 0);
+  CallFrame call = frameOfKind(wire::FrameKind::call, operation::kUploadFile,
+                               {{key::kPath, toUTF8(file->absolutePath())}}, file->descriptor() >= 0 ? 1 : 0);
   call.file = std::move(file);
   return call;
 }
 
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
-  const std::string* operation = event.string("op");
-  if (!operation || *operation != "removeUploadedFile:") return std::nullopt;
-  const Dictionary* arguments = event.dictionary("args");
-  return arguments ? arguments->uint32("call").value_or(0) : 0;
+  const std::string* operation = event.string(key::kOperation);
+  if (!operation || *operation != event::kRemoveUploadedFile) return std::nullopt;
+  const Dictionary* arguments = event.dictionary(key::kArguments);
+  return arguments ? arguments->uint32(key::kCall).value_or(0) : 0;
 }
 
 CallFrame logDataFrame(const veltra_value* data) {
   if (!data || !data->items()) return {VELTRA_INVALID, {}};
   if (!fits(data)) return {VELTRA_TOO_LARGE, {}};
-  return frameOfKind(wire::FrameKind::largeCall, kUploadLogData, {{"data", valueOfNode(*data)}});
+  return frameOfKind(wire::FrameKind::largeCall, operation::kUploadLogData,
+                     {{key::kData, valueOfNode(*data)}});
 }
 
 }  // namespace veltrad::client

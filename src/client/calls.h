@@ -14,20 +14,6 @@
 
 namespace veltrad::client {
 
-inline constexpr const char* kFetchStates = "fetchStatesWithUserInfo:completionHandler:";
-inline constexpr const char* kFetchDisplayURL = "fetchDisplayURL:";
-inline constexpr const char* kFinishSession = "finishSessionWithReply:";
-inline constexpr const char* kFlushMessages = "flushMessagesWithCompletion:";
-inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:";
-inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
-inline constexpr const char* kSendOneShot =
-    "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
-inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
-inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
-inline constexpr const char* kSetSessionInfo =
-    "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
-inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
-
 // The upload whose file the daemon's event asks to remove; nothing for other events.
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event);
 
@@ -42,10 +28,9 @@ CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> argume
 // dictionary.
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag);
-// A call whose one argument is a dictionary; left out where it is null and may be missing.
-enum class Missing { allowed, invalid };
-CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary,
-                          Missing missing);
+CallFrame messageDictionaryFrame(const veltra_value* message);
+// `userInfo` is a dictionary or null.
+CallFrame statesFrame(const veltra_value* userInfo);
 CallFrame sessionInfoFrame(const veltra_session_options& options);
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload);

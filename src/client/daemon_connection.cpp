@@ -65,9 +65,9 @@ DaemonConnection::DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, 
     : _socket(std::move(daemon.socket)),
       _epoll(::epoll_create1(EPOLL_CLOEXEC)),
       _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
-      _queueBytes(queueBytes),
       _handler(std::move(handler)),
-      _frames(std::move(daemon.reader)) {}
+      _frames(std::move(daemon.reader)),
+      _out(queueBytes) {}
 
 DaemonConnection::~DaemonConnection() {
   if (_thread.running()) close();
@@ -77,14 +77,14 @@ DaemonConnection::~DaemonConnection() {
 
 veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context, File file) {
   Lock lock(_lock);
-  return enqueue(std::move(frame), Call{nullptr, callback, context, std::move(file)});
+  return enqueue(std::move(frame), {nullptr, callback, context, std::move(file)});
 }
 
 Answer DaemonConnection::sendAndWait(std::string frame, File file) {
   if (onOwnThread()) return answerOfStatus(VELTRA_WOULD_DEADLOCK);
   Waiter waiter;
   Lock lock(_lock);
-  const veltra_status status = enqueue(std::move(frame), Call{&waiter, nullptr, nullptr, std::move(file)});
+  const veltra_status status = enqueue(std::move(frame), {&waiter, nullptr, nullptr, std::move(file)});
   if (status != VELTRA_OK) return answerOfStatus(status);
   while (!waiter.answer) {
     if (_reader == Reader::nobody) {
@@ -99,52 +99,22 @@ Answer DaemonConnection::sendAndWait(std::string frame, File file) {
   return std::move(waiter.answer);
 }
 
-veltra_status DaemonConnection::enqueue(std::string frame, const Call& call) {
+veltra_status DaemonConnection::enqueue(std::string frame, CallTable::Call call) {
   if (!_out.empty()) writeWaiting();  // the thread may be inside a callback
-  if (_ended || _closing || !_writable) {
-    ++_counts.dropped;
-    return VELTRA_NO_DAEMON;
-  }
-  if (!_out.empty() && _out.bytes() + frame.size() > _queueBytes) {
-    ++_counts.dropped;
-    return VELTRA_QUEUE_FULL;
-  }
-  const bool answered = call.waiter || call.callback || call.file;
-  const std::uint32_t callID = answered ? freeCallID() : 0;
-  if (answered) setCallID(frame, callID);
-  switch (_out.write(_socket.get(), std::move(frame), call.file)) {
-    case OutFrames::Wrote::gone:
-      ++_counts.dropped;
-      stopWriting();
-      return VELTRA_NO_DAEMON;
-    case OutFrames::Wrote::all:
-    case OutFrames::Wrote::some:
-      break;
-  }
-  if (answered) _calls.emplace(callID, call);
-  if (answered && !call.waiter) ++_unwaited;
+  const std::uint32_t callID = call.awaitsAnswer() ? _calls.freeID() : 0;
+  if (callID != 0) setCallID(frame, callID);
+  const veltra_status status = _out.write(_socket.get(), std::move(frame), call.file);
+  if (status != VELTRA_OK) return status;
+  if (callID != 0) _calls.add(callID, std::move(call));
   updateInterest();
   return VELTRA_OK;
 }
 
-std::uint32_t DaemonConnection::freeCallID() {
-  do {
-    ++_lastCallID;
-  } while (_lastCallID == 0 || _calls.contains(_lastCallID));
-  return _lastCallID;
-}
-
+// Where the daemon has gone, answers that came before are still to be read; the end of the connection follows
+// them.
 void DaemonConnection::writeWaiting() {
-  if (_writable && _out.writeWaiting(_socket.get()) == OutFrames::Wrote::gone) stopWriting();
+  _out.writeWaiting(_socket.get());
   updateInterest();
-}
-
-// Answers that came before the daemon went are still to be read; the end of the connection follows them.
-void DaemonConnection::stopWriting() {
-  _writable = false;
-  const std::uint64_t lost = _out.clear();
-  _counts.dropped += lost;
-  _lost += lost;
 }
 
 // ---- Answers in ----
@@ -229,50 +199,18 @@ void DaemonConnection::passOnReading() {
 }
 
 void DaemonConnection::deliver() {
+  const bool idle = !_calls.anyReady();
   for (Arrived& arrived : _arrived) {
-    if (arrived.callID == 0) {
-      takeEvent(std::move(arrived.event));
-      continue;
+    if (arrived.callID != 0) {
+      _calls.answer(arrived.callID, std::move(arrived.answer));
+    } else if (const auto callID = callToRemoveFileOf(arrived.event)) {
+      _calls.askForRemoval(*callID);
+    } else if (_handler) {
+      _calls.addEvent(std::move(arrived.event));
     }
-    const auto call = _calls.extract(arrived.callID);
-    if (call.empty()) continue;
-    if (!call.mapped().waiter) --_unwaited;
-    finish(call.mapped(), std::move(arrived.answer));
   }
   _arrived.clear();
-}
-
-// A request to remove a file comes before the answer to its upload; who takes that acts on it.
-void DaemonConnection::takeEvent(Dictionary event) {
-  if (const auto callID = callToRemoveFileOf(event)) {
-    const auto at = _calls.find(*callID);
-    if (at != _calls.end() && at->second.file) at->second.file->askForRemoval();
-  } else if (_handler) {
-    makeReady({nullptr, nullptr, nullptr, std::move(event)});
-  }
-}
-
-void DaemonConnection::finish(const Call& call, Answer answer) {
-  answer->file = call.file;
-  ++(answer->status == VELTRA_NO_REPLY ? _counts.unanswered : _counts.replies);
-  if (call.waiter) {
-    call.waiter->answer = std::move(answer);
-    call.waiter->changed.notifyOne();
-  } else {
-    makeReady({call.callback, call.context, std::move(answer), {}});
-  }
-}
-
-void DaemonConnection::makeReady(Ready item) {
-  if (!item.answer) {
-    if (_readyEvents == kMostWaitingEvents) {
-      ++_counts.dropped_events;
-      return;
-    }
-    ++_readyEvents;
-  }
-  if (_ready.empty() && !onOwnThread()) wake();
-  _ready.push_back(std::move(item));
+  if (idle && _calls.anyReady() && !onOwnThread()) wake();
 }
 
 // ---- The end ----
@@ -280,13 +218,10 @@ void DaemonConnection::makeReady(Ready item) {
 void DaemonConnection::end() {
   if (_ended) return;
   _ended = true;
-  stopWriting();
+  _out.stop();
   unwatch();
-  std::vector<std::pair<std::uint32_t, Call>> open(_calls.begin(), _calls.end());
-  _calls.clear();
-  _unwaited = 0;
-  std::sort(open.begin(), open.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
-  for (const auto& [callID, call] : open) finish(call, answerOfStatus(VELTRA_NO_REPLY, kConnectionEnded));
+  _calls.endAll(kConnectionEnded);
+  if (_calls.anyReady() && !onOwnThread()) wake();
 }
 
 std::uint64_t DaemonConnection::close() {
@@ -294,7 +229,7 @@ std::uint64_t DaemonConnection::close() {
   const auto deadline = steady_clock::now() + kClosingTimeout;
   {
     Lock lock(_lock);
-    _closing = true;
+    _out.close();
     while (!_out.empty() && steady_clock::now() < deadline) {
       const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - steady_clock::now());
       _lock.unlock();
@@ -309,14 +244,15 @@ std::uint64_t DaemonConnection::close() {
   }
   _thread.join();
   Lock lock(_lock);
-  return _lost;
+  return _out.lost();
 }
 
 veltra_statistics DaemonConnection::statistics() {
   Lock lock(_lock);
-  veltra_statistics counts = _counts;
+  veltra_statistics counts = _calls.counts();
   counts.sent = _out.written();
   counts.queued = _out.calls();
+  counts.dropped = _out.dropped();
   return counts;
 }
 
@@ -359,13 +295,12 @@ void DaemonConnection::serve(std::uint32_t events) {
 
 // False when the thread is to end.
 bool DaemonConnection::runReady() {
-  std::deque<Ready> batch;
+  std::deque<CallTable::Ready> batch;
   {
     Lock lock(_lock);
-    batch.swap(_ready);
-    _readyEvents = 0;
+    _calls.takeReady(batch);
   }
-  for (Ready& item : batch) {
+  for (CallTable::Ready& item : batch) {
     if (!item.answer) {
       _handler(item.event);
       continue;
@@ -374,7 +309,7 @@ bool DaemonConnection::runReady() {
     if (item.callback) item.callback(item.context, item.answer.get());
   }
   Lock lock(_lock);
-  return !_stopping || !_ready.empty();
+  return !_stopping || _calls.anyReady();
 }
 
 void DaemonConnection::wake() {
@@ -389,7 +324,7 @@ void DaemonConnection::unwatch() {
 void DaemonConnection::updateInterest() {
   if (!_watched) return;
   std::uint32_t wanted = EPOLLRDHUP;
-  if (_reader != Reader::waiter && (_unwaited > 0 || _handler)) wanted |= EPOLLIN;
+  if (_reader != Reader::waiter && (_calls.unwaited() > 0 || _handler)) wanted |= EPOLLIN;
   if (!_out.empty()) wanted |= EPOLLOUT;
   if (std::exchange(_interest, wanted) == wanted) return;
   epoll_event socketEvent{wanted, {}};

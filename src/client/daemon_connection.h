@@ -4,12 +4,10 @@
 
 #include <atomic>
 #include <cstdint>
-#include <deque>
 #include <functional>
 #include <memory>
 #include <string>
 #include <thread>
-#include <unordered_map>
 #include <vector>
 
 #include "base/file_descriptor.h"
@@ -17,6 +15,7 @@
 #include "base/thread.h"
 #include "base/value.h"
 #include "client/answer.h"
+#include "client/call_table.h"
 #include "client/daemon_socket.h"
 #include "client/out_frames.h"
 #include "veltra/veltra.h"
@@ -24,15 +23,16 @@
 
 namespace veltrad::client {
 
-// Events that may wait for a slow event handler; the next is dropped and counted.
-inline constexpr std::size_t kMostWaitingEvents = 4096;
-
 // Job: carries calls to the daemon in the order in which they were made and ends each exactly once.
 //
 // Whoever holds the reading role reads the socket, alone: a thread that waits for its own answer takes the
 // role when it is free, which makes such a call as fast as a bare exchange on the socket; otherwise the
 // connection's thread does. Both hand each answer to the thread that waits for it, or into the queue of
 // callbacks, which the connection's thread alone runs, under no lock.
+//
+// Its 18 fields are the descriptors that its thread sleeps on and what epoll knows of them, who reads and
+// what that has brought, the frames out and the calls under way: who reads and what is watched follow from
+// what waits, so that all of it changes under one lock.
 //
 // close() ends it; no other call may start after that. Threads that wait hold a share of it, since they leave
 // after their answer is there.
@@ -67,26 +67,9 @@ class DaemonConnection {
   enum class Reader { nobody, waiter, ownThread };
   enum class Received { something, nothing, end };
 
-  struct Waiter {
-    Condition changed;
-    Answer answer;
-  };
-  struct Call {
-    Waiter* waiter = nullptr;  // or else a callback
-    veltra_callback callback = nullptr;
-    void* context = nullptr;
-    File file;  // of an upload
-  };
   // What came in with one read; an event when `callID` is 0.
   struct Arrived {
     std::uint32_t callID = 0;
-    Answer answer;
-    Dictionary event;
-  };
-  // What the connection's thread is to run; an event when there is no answer.
-  struct Ready {
-    veltra_callback callback = nullptr;
-    void* context = nullptr;
     Answer answer;
     Dictionary event;
   };
@@ -103,17 +86,12 @@ class DaemonConnection {
   bool takeFrames();  // false when nothing sensible can follow
   void waitForSocket(short events, int milliseconds = -1);
 
-  veltra_status enqueue(std::string frame, const Call& call) REQUIRES(_lock);
-  std::uint32_t freeCallID() REQUIRES(_lock);
+  veltra_status enqueue(std::string frame, CallTable::Call call) REQUIRES(_lock);
   void readAsWaiter(const Waiter& waiter) REQUIRES(_lock);
   void readAsOwnThread() REQUIRES(_lock);
   void deliver() REQUIRES(_lock);
-  void takeEvent(Dictionary event) REQUIRES(_lock);
-  void finish(const Call& call, Answer answer) REQUIRES(_lock);
-  void makeReady(Ready item) REQUIRES(_lock);
   void passOnReading() REQUIRES(_lock);
   void writeWaiting() REQUIRES(_lock);
-  void stopWriting() REQUIRES(_lock);
   void end() REQUIRES(_lock);
   void updateInterest() REQUIRES(_lock);
   void unwatch() REQUIRES(_lock);
@@ -123,7 +101,6 @@ class DaemonConnection {
   const FileDescriptor _socket;
   FileDescriptor _epoll;
   FileDescriptor _wakeUp;
-  const std::size_t _queueBytes;
   const EventHandler _handler;
   Thread _thread;
   std::atomic<std::thread::id> _ownThread{};
@@ -136,20 +113,12 @@ class DaemonConnection {
   Reader _reader GUARDED_BY(_lock) = Reader::ownThread;  // which first takes what came behind the hello
   std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
   OutFrames _out GUARDED_BY(_lock);
-  std::unordered_map<std::uint32_t, Call> _calls GUARDED_BY(_lock);
-  std::size_t _unwaited GUARDED_BY(_lock) = 0;  // of _calls: their answers are for the own thread
-  std::uint32_t _lastCallID GUARDED_BY(_lock) = 0;
-  std::deque<Ready> _ready GUARDED_BY(_lock);
-  std::size_t _readyEvents GUARDED_BY(_lock) = 0;  // of _ready
-  std::uint32_t _interest GUARDED_BY(_lock) = 0;   // what epoll was last told
+  CallTable _calls GUARDED_BY(_lock);
+  std::uint32_t _interest GUARDED_BY(_lock) = 0;  // what epoll was last told
   bool _watched GUARDED_BY(_lock) = true;
   bool _hungUp GUARDED_BY(_lock) = false;  // the daemon has ended; what it sent before may still be unread
-  bool _writable GUARDED_BY(_lock) = true;
   bool _ended GUARDED_BY(_lock) = false;
-  bool _closing GUARDED_BY(_lock) = false;
   bool _stopping GUARDED_BY(_lock) = false;  // the thread ends once nothing is ready
-  std::uint64_t _lost GUARDED_BY(_lock) = 0;
-  veltra_statistics _counts GUARDED_BY(_lock){};
 };
 
 }  // namespace veltrad::client

@@ -14,8 +14,11 @@
 #include "base/property_list.h"
 #include "base/text.h"
 #include "client/answer.h"
+#include "wire/names.h"
 
 namespace veltrad::client {
+
+namespace key = wire::key;
 
 namespace {
 
@@ -137,14 +140,14 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
   const auto parsed = parseBinaryPropertyList(frame.body);
   const Dictionary* body = parsed ? parsed.value().asDictionary() : nullptr;
   if (frame.header.kind == wire::FrameKind::refusal && body) {
-    const Dictionary* error = body->dictionary("error");
-    wire::ReportingError refusal = error ? errorOfDictionary(*error) : wire::ReportingError{};
+    const Dictionary* error = body->dictionary(key::kError);
+    wire::ReportingError refusal = error ? wire::errorOfDictionary(*error) : wire::ReportingError{};
     if (refusal.description.empty()) {
       refusal.description = fmt::format("The daemon on {} refused the connection and gave no reason.", shown);
     }
     return ConnectFailure{VELTRA_REFUSED, std::move(refusal.description)};
   }
-  const auto wire = body ? body->uint32("wire") : std::nullopt;
+  const auto wire = body ? body->uint32(key::kWire) : std::nullopt;
   if (frame.header.kind != wire::FrameKind::hello || !wire) {
     return noDaemon(
         fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
@@ -169,7 +172,7 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
   DaemonSocket daemon{std::move(connected).value(), {}};
   const std::string hello =
       wire::makeFrame(wire::FrameKind::hello, 0,
-                      Dictionary{{"wire", Value(wire::kWireVersion)}, {"library", veltra_version()}});
+                      Dictionary{{key::kWire, Value(wire::kWireVersion)}, {key::kLibrary, veltra_version()}});
   // A daemon that refuses may end the connection before all of this is written; its reason is still to be
   // read.
   (void)sendAll(daemon.socket.get(), hello + firstCalls);

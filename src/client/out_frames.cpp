@@ -42,9 +42,11 @@ void announceNoDescriptor(std::string& frame) {
 
 }  // namespace
 
-OutFrames::Wrote OutFrames::write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file) {
-  if (file && file->descriptor() < 0) file = nullptr;
+veltra_status OutFrames::write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file) {
+  if (_closed) return refuse(VELTRA_NO_DAEMON);
   const bool first = _frames.empty();
+  if (!first && _bytes + frame.size() > _most) return refuse(VELTRA_QUEUE_FULL);
+  if (file && file->descriptor() < 0) file = nullptr;
   const bool lends = file != nullptr;
   std::size_t sent = 0;
   if (first && !lends) {
@@ -52,23 +54,43 @@ OutFrames::Wrote OutFrames::write(int socket, std::string frame, std::shared_ptr
     do {
       count = ::send(socket, frame.data(), frame.size(), kFlags);
     } while (count < 0 && errno == EINTR);
-    if (count < 0 && !full(errno)) return Wrote::gone;
+    if (count < 0 && !full(errno)) {
+      stop();
+      return refuse(VELTRA_NO_DAEMON);
+    }
     if (count > 0) sent = static_cast<std::size_t>(count);
     if (sent == frame.size()) {
       ++_written;
-      return Wrote::all;
+      return VELTRA_OK;
     }
     _firstTaken = sent;
   }
   _bytes += frame.size() - sent;
   _frames.push_back({std::move(frame), std::move(file)});
-  if (!first || !lends) return Wrote::some;
-  const Wrote wrote = writeWaiting(socket);
-  if (wrote == Wrote::gone) clear();
-  return wrote;
+  if (!first || !lends || writeAll(socket)) return VELTRA_OK;
+  _frames.clear();  // refused, not lost
+  stop();
+  return refuse(VELTRA_NO_DAEMON);
 }
 
-OutFrames::Wrote OutFrames::writeWaiting(int socket) {
+veltra_status OutFrames::refuse(veltra_status why) {
+  ++_refused;
+  return why;
+}
+
+void OutFrames::writeWaiting(int socket) {
+  if (!writeAll(socket)) stop();
+}
+
+void OutFrames::stop() {
+  _closed = true;
+  _lost += _frames.size();
+  _frames.clear();
+  _bytes = _firstTaken = 0;
+}
+
+// False: the peer takes nothing any more.
+bool OutFrames::writeAll(int socket) {
   while (!_frames.empty()) {
     const ssize_t sent = send(socket);
     if (sent >= 0) {
@@ -77,10 +99,10 @@ OutFrames::Wrote OutFrames::writeWaiting(int socket) {
       announceNoDescriptor(_frames.front().bytes);
       _frames.front().file = nullptr;
     } else if (errno != EINTR) {
-      return full(errno) ? Wrote::some : Wrote::gone;
+      return full(errno);
     }
   }
-  return Wrote::all;
+  return true;
 }
 
 // As many frames as go at once: a descriptor travels with the first byte of the first.
@@ -113,13 +135,6 @@ void OutFrames::taken(std::size_t count) {
     _firstTaken = 0;
     ++_written;
   }
-}
-
-std::uint64_t OutFrames::clear() {
-  const std::uint64_t lost = _frames.size();
-  _frames.clear();
-  _bytes = _firstTaken = 0;
-  return lost;
 }
 
 }  // namespace veltrad::client

@@ -5,9 +5,12 @@
 #include "client/calls.h"
 #include "client/daemon_connection.h"
 #include "client/daemon_socket.h"
+#include "wire/names.h"
 #include "wire/socket_path.h"
 
 namespace client = veltrad::client;
+namespace key = veltrad::wire::key;
+namespace operation = veltrad::wire::operation;
 
 using client::Answer;
 using client::CallFrame;
@@ -20,7 +23,6 @@ struct veltra_session {
 namespace {
 
 constexpr std::size_t kDefaultQueueBytes = 1u << 20;
-constexpr const char* kAggregatedOperation = "sendMessageToClient:timestamp:category:type:payload:";
 
 veltra_session* failed(veltra_status why, const std::string& text, veltra_status* status, char** error) {
   if (status) *status = why;
@@ -32,16 +34,16 @@ client::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_cal
                                                           void* context) {
   if (!callback) return nullptr;
   return [callback, context](const Dictionary& event) {
-    const std::string* operation = event.string("op");
-    if (!operation || *operation != kAggregatedOperation) return;
-    const Dictionary* given = event.dictionary("args");
+    const std::string* operation = event.string(key::kOperation);
+    if (!operation || *operation != veltrad::wire::event::kSendMessageToClient) return;
+    const Dictionary* given = event.dictionary(key::kArguments);
     const Dictionary arguments = given ? *given : Dictionary{};
-    const Dictionary* sessionInfo = arguments.dictionary("sessionInfo");
-    const Dictionary* payload = arguments.dictionary("payload");
+    const Dictionary* sessionInfo = arguments.dictionary(key::kSessionInfo);
+    const Dictionary* payload = arguments.dictionary(key::kPayload);
     const auto infoNode = sessionInfo ? client::nodeOfDictionary(*sessionInfo) : nullptr;
     const auto payloadNode = payload ? client::nodeOfDictionary(*payload) : nullptr;
-    callback(context, infoNode.get(), arguments.real("timestamp").value_or(0),
-             arguments.uint16("category").value_or(0), arguments.uint16("type").value_or(0),
+    callback(context, infoNode.get(), arguments.real(key::kTimestamp).value_or(0),
+             arguments.uint16(key::kCategory).value_or(0), arguments.uint16(key::kType).value_or(0),
              payloadNode.get());
   };
 }
@@ -116,11 +118,11 @@ void veltra_free(char* text) {
 }
 
 veltra_status veltra_session_start(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(client::kStartConfig), callback, context);
+  return send(session, client::callFrame(operation::kStartConfig), callback, context);
 }
 
 veltra_status veltra_session_start_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(client::kStartConfig), reply);
+  return sendAndWait(session, client::callFrame(operation::kStartConfig), reply);
 }
 
 veltra_status veltra_session_send(veltra_session* session, uint16_t category, uint16_t type,
@@ -136,16 +138,12 @@ veltra_status veltra_session_send_wait(veltra_session* session, uint16_t categor
 
 veltra_status veltra_session_send_dictionary(veltra_session* session, const veltra_value* message,
                                              veltra_callback callback, void* context) {
-  return send(session,
-              client::dictionaryFrame(client::kSendDictionary, "message", message, client::Missing::invalid),
-              callback, context);
+  return send(session, client::messageDictionaryFrame(message), callback, context);
 }
 
 veltra_status veltra_session_send_dictionary_wait(veltra_session* session, const veltra_value* message,
                                                   veltra_reply** reply) {
-  return sendAndWait(
-      session, client::dictionaryFrame(client::kSendDictionary, "message", message, client::Missing::invalid),
-      reply);
+  return sendAndWait(session, client::messageDictionaryFrame(message), reply);
 }
 
 veltra_status veltra_session_send_one_shot(veltra_session* session, const veltra_session_options* who,
@@ -161,11 +159,11 @@ veltra_status veltra_session_send_one_shot_wait(veltra_session* session, const v
 }
 
 veltra_status veltra_session_flush(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(client::kFlushMessages), callback, context);
+  return send(session, client::callFrame(operation::kFlushMessages), callback, context);
 }
 
 veltra_status veltra_session_flush_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(client::kFlushMessages), reply);
+  return sendAndWait(session, client::callFrame(operation::kFlushMessages), reply);
 }
 
 veltra_status veltra_session_upload_file(veltra_session* session, const char* path, veltra_callback callback,
@@ -190,32 +188,28 @@ veltra_status veltra_session_upload_log_data_wait(veltra_session* session, const
 
 veltra_status veltra_session_states(veltra_session* session, const veltra_value* user_info,
                                     veltra_callback callback, void* context) {
-  return send(session,
-              client::dictionaryFrame(client::kFetchStates, "userInfo", user_info, client::Missing::allowed),
-              callback, context);
+  return send(session, client::statesFrame(user_info), callback, context);
 }
 
 veltra_status veltra_session_states_wait(veltra_session* session, const veltra_value* user_info,
                                          veltra_reply** reply) {
-  return sendAndWait(
-      session, client::dictionaryFrame(client::kFetchStates, "userInfo", user_info, client::Missing::allowed),
-      reply);
+  return sendAndWait(session, client::statesFrame(user_info), reply);
 }
 
 veltra_status veltra_session_display_url(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(client::kFetchDisplayURL), callback, context);
+  return send(session, client::callFrame(operation::kFetchDisplayURL), callback, context);
 }
 
 veltra_status veltra_session_display_url_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(client::kFetchDisplayURL), reply);
+  return sendAndWait(session, client::callFrame(operation::kFetchDisplayURL), reply);
 }
 
 veltra_status veltra_session_finish(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(client::kFinishSession), callback, context);
+  return send(session, client::callFrame(operation::kFinishSession), callback, context);
 }
 
 veltra_status veltra_session_finish_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(client::kFinishSession), reply);
+  return sendAndWait(session, client::callFrame(operation::kFinishSession), reply);
 }
 
 void veltra_session_statistics(veltra_session* session, veltra_statistics* statistics) {

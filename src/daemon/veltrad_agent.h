@@ -12,6 +12,7 @@
 
 #include "base/mutex.h"
 #include "daemon/correlated_list.h"
+#include "daemon/lock_ranks.h"
 #include "daemon/storebag_cache.h"
 #include "ipc/connection.h"
 #include "session/session_delegate.h"
@@ -71,10 +72,10 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   platform::Transaction& _transaction;
 
   // Also covers opening and closing the transaction.
-  RecursiveMutex _sessionListLock SESSION_LIST_LOCK{LockRank::sessionList};
+  RecursiveMutex _sessionListLock SESSION_LIST_LOCK;
   std::vector<std::shared_ptr<session::VeltradSession>> _sessionList GUARDED_BY(_sessionListLock);
 
-  RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
+  RecursiveMutex _lock STOREBAG_CACHE_LOCK;
   StorebagCache _cachedStorebags GUARDED_BY(_lock);
   // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
   // the sessions beside it have freed.

@@ -8,8 +8,12 @@
 #include "base/property_list.h"
 #include "base/text.h"
 #include "ipc/pending_reply.h"
+#include "wire/names.h"
 
 namespace veltrad::ipc {
+
+namespace key = wire::key;
+namespace operation = wire::operation;
 
 namespace {
 
@@ -38,11 +42,11 @@ std::optional<Array> takenArray(Call& call, std::string_view name) {
 }
 
 Refusal setSessionInfo(Call& call) {
-  const bool aggregates = call.arguments.boolean("hasAggregationBlock").value_or(false);
-  auto sessionInfo = takenDictionary(call, "sessionInfo");
-  auto userInfo = takenDictionary(call, "userInfo");
+  const bool aggregates = call.arguments.boolean(key::kHasAggregationBlock).value_or(false);
+  auto sessionInfo = takenDictionary(call, key::kSessionInfo);
+  auto userInfo = takenDictionary(call, key::kUserInfo);
   const bool described = call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
-                                                     takenArray(call, "frameworksToCheck"), aggregates);
+                                                     takenArray(call, key::kFrameworksToCheck), aggregates);
   if (!described && call.pending) {
     call.pending->fail(wire::makeReportingError(
         "The session's description is more than the daemon may keep for its user; try again later.", -1));
@@ -58,7 +62,7 @@ Refusal startConfig(Call& call) {
 }
 
 Refusal fetchStates(Call& call) {
-  call.session.fetchStatesWithUserInfo(takenDictionary(call, "userInfo"),
+  call.session.fetchStatesWithUserInfo(takenDictionary(call, key::kUserInfo),
                                        namesReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -69,18 +73,18 @@ Refusal fetchDisplayURL(Call& call) {
 }
 
 Refusal sendMessageWithCategory(Call& call) {
-  const auto category = call.arguments.uint16("category");
-  if (!category) return mustBe("category", "a number");
-  const auto type = call.arguments.uint16("type");
-  if (!type) return mustBe("type", "a number");
-  call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, "payload"),
+  const auto category = call.arguments.uint16(key::kCategory);
+  if (!category) return mustBe(key::kCategory, "a number");
+  const auto type = call.arguments.uint16(key::kType);
+  if (!type) return mustBe(key::kType, "a number");
+  call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, key::kPayload),
                                        stringReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithDictionary(Call& call) {
-  auto message = takenDictionary(call, "message");
-  if (!message) return mustBe("message", "a dictionary");
+  auto message = takenDictionary(call, key::kMessage);
+  if (!message) return mustBe(key::kMessage, "a dictionary");
   call.session.sendMessageWithDictionary(std::move(*message), stringReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -96,28 +100,28 @@ Refusal finishSession(Call& call) {
 }
 
 Refusal uploadFile(Call& call) {
-  const std::string* path = call.arguments.string("path");
-  if (!path) return mustBe("path", "a text");
+  const std::string* path = call.arguments.string(key::kPath);
+  if (!path) return mustBe(key::kPath, "a text");
   call.session.uploadFileAtPath(*path, call.extensionToken, uploadedReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal uploadLogData(Call& call) {
-  auto data = takenArray(call, "data");
-  if (!data) return mustBe("data", "an array");
+  auto data = takenArray(call, key::kData);
+  if (!data) return mustBe(key::kData, "an array");
   call.session.uploadLogData(std::move(*data), uploadLogDataReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithSessionInfo(Call& call) {
-  const auto category = call.arguments.uint16("category");
-  if (!category) return mustBe("category", "a number");
-  const auto type = call.arguments.uint16("type");
-  if (!type) return mustBe("type", "a number");
-  auto sessionInfo = takenDictionary(call, "sessionInfo");
-  auto userInfo = takenDictionary(call, "userInfo");
+  const auto category = call.arguments.uint16(key::kCategory);
+  if (!category) return mustBe(key::kCategory, "a number");
+  const auto type = call.arguments.uint16(key::kType);
+  if (!type) return mustBe(key::kType, "a number");
+  auto sessionInfo = takenDictionary(call, key::kSessionInfo);
+  auto userInfo = takenDictionary(call, key::kUserInfo);
   call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
-                                          takenDictionary(call, "payload"),
+                                          takenDictionary(call, key::kPayload),
                                           stringReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -127,21 +131,19 @@ struct Operation {
   Refusal (*run)(Call&);
 };
 
-constexpr std::string_view kUploadLogData = "uploadLogData:completionHandler:";
-
 // The most frequent first.
 constexpr Operation kOperations[] = {
-    {"sendMessageWithCategory:type:payload:reply:", sendMessageWithCategory},
-    {"sendMessageWithDictionary:reply:", sendMessageWithDictionary},
-    {"flushMessagesWithCompletion:", flushMessages},
-    {"fetchStatesWithUserInfo:completionHandler:", fetchStates},
-    {"setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", setSessionInfo},
-    {"startConfigWithCompletionHandler:", startConfig},
-    {"finishSessionWithReply:", finishSession},
-    {"sendMessageWithSessionInfo:userInfo:category:type:payload:reply:", sendMessageWithSessionInfo},
-    {"fetchDisplayURL:", fetchDisplayURL},
-    {"uploadFileAtPath:extensionToken:completionHandler:", uploadFile},
-    {kUploadLogData, uploadLogData},
+    {operation::kSendMessage, sendMessageWithCategory},
+    {operation::kSendDictionary, sendMessageWithDictionary},
+    {operation::kFlushMessages, flushMessages},
+    {operation::kFetchStates, fetchStates},
+    {operation::kSetSessionInfo, setSessionInfo},
+    {operation::kStartConfig, startConfig},
+    {operation::kFinishSession, finishSession},
+    {operation::kSendOneShot, sendMessageWithSessionInfo},
+    {operation::kFetchDisplayURL, fetchDisplayURL},
+    {operation::kUploadFile, uploadFile},
+    {operation::kUploadLogData, uploadLogData},
 };
 
 const Operation* operationNamed(std::string_view name) {
@@ -256,14 +258,14 @@ Refusal runCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
   auto decoded = large ? decodeLargeCall(frame, memory) : decodeCall(frame, memory);
   if (!decoded) return decoded.error();
   Dictionary& body = decoded.value();
-  const std::string* name = body.string("op");
+  const std::string* name = body.string(key::kOperation);
   if (!name) return "\"op\" must be a text";
   const Operation* operation = operationNamed(*name);
   if (!operation) return fmt::format("unknown operation \"{}\"", shortened(*name));
-  if (large && operation->name != kUploadLogData) {
-    return fmt::format("a large call is for \"{}\" alone, not for \"{}\"", kUploadLogData, *name);
+  if (large && operation->name != operation::kUploadLogData) {
+    return fmt::format("a large call is for \"{}\" alone, not for \"{}\"", operation::kUploadLogData, *name);
   }
-  auto given = body.take("args");
+  auto given = body.take(key::kArguments);
   auto arguments = given ? std::move(*given).takeDictionary() : std::nullopt;
   if (!arguments) arguments.emplace();
   Call call{session, *arguments, extensionToken, pending};

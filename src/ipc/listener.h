@@ -37,6 +37,9 @@ struct ListenerOptions {
 // thread; a refused one gets a refusal frame that says why. The delegate, the entitlements, the lent files
 // and the counters outlive it. resume() and invalidate() belong to the thread that made it, which is never a
 // connection's own.
+//
+// Its 20 fields are what each connection is given and the bounds, what accepting needs, and the connections
+// that it must find again when it stops.
 class Listener {
  public:
   Listener(ListenerOptions options, ListenerDelegate& delegate);

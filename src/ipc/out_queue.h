@@ -25,7 +25,8 @@ inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
 // Job: takes frames from any thread, writes them without blocking and in order, and bounds what a slow reader
 // costs, in bytes and within what its user may keep. Owns the socket and the wake-up descriptor. Shared by
 // the connection and by everybody who may still answer or send, so it may outlive the connection; the
-// counters outlive it.
+// counters outlive it. Its 14 fields: the descriptors stand here twice, for their owner under the lock and as
+// numbers for the connection's thread, which polls without it.
 class OutQueue {
  public:
   enum class Sent {

@@ -6,13 +6,16 @@
 #include <new>
 
 #include "wire/frame.h"
+#include "wire/names.h"
 
 namespace veltrad::ipc {
+
+namespace key = wire::key;
 
 PendingReply::~PendingReply() {
   if (_answered.load(std::memory_order_acquire)) return;
   try {
-    fail(wire::makeReportingError("The daemon gave no reply.", -1));
+    fail(wire::makeReportingError(wire::kNoReplyDescription, -1));
   } catch (const std::bad_alloc&) {
     _out->requestEnd();
   }
@@ -21,13 +24,13 @@ PendingReply::~PendingReply() {
 void PendingReply::answer(Dictionary results) {
   if (_answered.exchange(true, std::memory_order_acq_rel)) return;
   Dictionary body;
-  body.set("results", std::move(results));
+  body.set(key::kResults, std::move(results));
   send(std::move(body));
 }
 
 void PendingReply::fail(const wire::ReportingError& error) {
   if (_answered.exchange(true, std::memory_order_acq_rel)) return;
-  send({{"error", wire::dictionaryOfError(error)}});
+  send({{key::kError, wire::dictionaryOfError(error)}});
 }
 
 void PendingReply::send(Dictionary body) noexcept {
@@ -46,13 +49,13 @@ void PendingReply::sendFrame(Dictionary body) {
                                            frame.size() - wire::kFrameHeaderBytes, wire::kFrameBodyLimit),
                                -1);
   _out->sendReply(
-      wire::makeFrame(wire::FrameKind::reply, _callID, {{"error", wire::dictionaryOfError(error)}}));
+      wire::makeFrame(wire::FrameKind::reply, _callID, {{key::kError, wire::dictionaryOfError(error)}}));
 }
 
 namespace {
 
 void setError(Dictionary& results, const std::optional<wire::ReportingError>& error) {
-  if (error) results.set("error", wire::dictionaryOfError(*error));
+  if (error) results.set(key::kError, wire::dictionaryOfError(*error));
 }
 
 }  // namespace
@@ -61,7 +64,7 @@ wire::StringReply stringReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::string> text) {
     Dictionary results;
-    if (text) results.set("reply", std::move(*text));
+    if (text) results.set(key::kReply, std::move(*text));
     pending->answer(std::move(results));
   };
 }
@@ -70,7 +73,7 @@ wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::vector<std::string>> names) {
     Dictionary results;
-    if (names) results.set("backends", Array(names->begin(), names->end()));
+    if (names) results.set(key::kBackends, Array(names->begin(), names->end()));
     pending->answer(std::move(results));
   };
 }
@@ -80,7 +83,7 @@ wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
   return [pending = std::move(pending)](std::optional<std::string> text,
                                         std::optional<wire::ReportingError> error) {
     Dictionary results;
-    if (text) results.set("reply", std::move(*text));
+    if (text) results.set(key::kReply, std::move(*text));
     setError(results, error);
     pending->answer(std::move(results));
   };
@@ -88,13 +91,13 @@ wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
 
 wire::BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
-  return [pending = std::move(pending)](bool uploaded) { pending->answer({{"uploaded", uploaded}}); };
+  return [pending = std::move(pending)](bool uploaded) { pending->answer({{key::kUploaded, uploaded}}); };
 }
 
 wire::UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](bool uploaded, std::optional<wire::ReportingError> error) {
-    Dictionary results{{"uploaded", uploaded}};
+    Dictionary results{{key::kUploaded, uploaded}};
     setError(results, error);
     pending->answer(std::move(results));
   };

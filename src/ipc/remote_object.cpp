@@ -4,17 +4,22 @@
 #include <fmt/format.h>
 
 #include "wire/frame.h"
+#include "wire/names.h"
 
 namespace veltrad::ipc {
+
+namespace event = wire::event;
+namespace key = wire::key;
 
 void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, double timestamp,
                                        std::uint16_t category, std::uint16_t type,
                                        std::optional<Dictionary> payload) {
-  Dictionary arguments{{"timestamp", timestamp}, {"category", unsigned{category}}, {"type", unsigned{type}}};
-  if (sessionInfo) arguments.set("sessionInfo", std::move(*sessionInfo));
-  if (payload) arguments.set("payload", std::move(*payload));
-  Dictionary body{{"op", "sendMessageToClient:timestamp:category:type:payload:"}};
-  body.set("args", std::move(arguments));
+  Dictionary arguments{
+      {key::kTimestamp, timestamp}, {key::kCategory, unsigned{category}}, {key::kType, unsigned{type}}};
+  if (sessionInfo) arguments.set(key::kSessionInfo, std::move(*sessionInfo));
+  if (payload) arguments.set(key::kPayload, std::move(*payload));
+  Dictionary body{{key::kOperation, event::kSendMessageToClient}};
+  body.set(key::kArguments, std::move(arguments));
   const std::string frame = wire::makeFrame(wire::FrameKind::event, 0, std::move(body));
   const OutQueue::Sent sent = _out->sendEvent(frame);
   if (sent == OutQueue::Sent::done || !_handler) return;
@@ -36,8 +41,8 @@ void RemoteObject::sendMessageToClient(std::optional<Dictionary> sessionInfo, do
 }
 
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
-  Dictionary body{{"op", "removeUploadedFile:"}};
-  body.set("args", Dictionary{{"call", callID}});
+  Dictionary body{{key::kOperation, event::kRemoveUploadedFile}};
+  body.set(key::kArguments, Dictionary{{key::kCall, callID}});
   // Within the bound of replies: it is worth as much as the one that follows it.
   return out.sendReply(wire::makeFrame(wire::FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }

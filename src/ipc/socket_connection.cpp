@@ -12,8 +12,11 @@
 #include "ipc/dispatcher.h"
 #include "ipc/remote_object.h"
 #include "platform/log.h"
+#include "wire/names.h"
 
 namespace veltrad::ipc {
+
+namespace key = wire::key;
 
 namespace {
 
@@ -28,7 +31,7 @@ constexpr std::chrono::seconds kLongestWaitForFrames{2};
 
 std::string refusalFrame(const std::string& description) {
   return wire::makeFrame(wire::FrameKind::refusal, 0,
-                         {{"error", wire::dictionaryOfError(wire::makeReportingError(description, -1))}});
+                         {{key::kError, wire::dictionaryOfError(wire::makeReportingError(description, -1))}});
 }
 
 std::string SocketConnection::describe(std::uint64_t number, const Peer& peer) {
@@ -212,7 +215,7 @@ bool SocketConnection::greet(const wire::Frame& frame) {
   }
   const auto body = decodeFrameBody(frame);
   if (!body) return violation(fmt::format("The hello cannot be read: {}.", body.error()));
-  const Value* stated = body.value().find("wire");
+  const Value* stated = body.value().find(key::kWire);
   const auto wire = stated ? stated->toInt64() : std::nullopt;
   if (!wire) return violation("The hello cannot be read: \"wire\" must be a number.");
   if (*wire != wire::kWireVersion) {
@@ -220,8 +223,8 @@ bool SocketConnection::greet(const wire::Frame& frame) {
                                  wire::kWireVersion));
   }
   _greeted = true;
-  _out->sendReply(
-      wire::makeFrame(wire::FrameKind::hello, 0, {{"wire", wire::kWireVersion}, {"daemon", kVersion}}));
+  _out->sendReply(wire::makeFrame(wire::FrameKind::hello, 0,
+                                  {{key::kWire, wire::kWireVersion}, {key::kDaemon, kVersion}}));
   return true;
 }
 

@@ -21,6 +21,9 @@ namespace veltrad::ipc {
 // the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
 // and remoteObjectProxyWithErrorHandler() may be called by any thread. Entitlements, lent files and
 // counters outlive it. A session and its connection hold each other until run() returns.
+//
+// Its 17 fields are the services that a call may need, what the delegate has set, and how far the
+// conversation has come.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
   SocketConnection(std::uint64_t number, FileDescriptor socket, Peer peer, Entitlements& entitlements,

@@ -41,10 +41,12 @@ struct Target {
   int facility = kUserFacility;
 };
 
-// A line may be written under any other lock, the leaves included: this one is held for two copies and takes
-// nothing.
+// A line may be written under any other lock, the leaves included: the sink's is held for two copies and
+// takes nothing.
+constexpr LockRank kLogSinkRank{101};
+
 struct State {
-  Mutex mutex LEAF_LOCK{static_cast<LockRank>(static_cast<int>(LockRank::leaf) + 1)};
+  Mutex mutex LEAF_LOCK{kLogSinkRank};
   std::shared_ptr<const Target> target GUARDED_BY(mutex) = std::make_shared<const Target>();
   std::shared_ptr<const Sink> sink GUARDED_BY(mutex);
 };

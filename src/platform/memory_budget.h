@@ -66,6 +66,9 @@ class Evictable {
   virtual void dropOldest() = 0;
 };
 
+// Of those who wait for memory, which is paid back under any lock, the log sink's included.
+inline constexpr LockRank kMemoryRank{102};
+
 // The sums of all user ids. Outlives its accounts' charges through them.
 class MemoryTotals {
  public:
@@ -75,7 +78,7 @@ class MemoryTotals {
   std::atomic<std::size_t> used{0};
   std::atomic<std::size_t> kept{0};
   std::atomic<std::size_t> waiting{0};  // threads in waitToCharge()
-  Mutex mutex LEAF_LOCK{LockRank::memory};
+  Mutex mutex LEAF_LOCK{kMemoryRank};
   Condition changed;
 };
 

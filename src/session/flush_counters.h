@@ -6,6 +6,7 @@
 #include <string>
 
 #include "base/mutex.h"
+#include "session/lock_ranks.h"
 #include "wire/client_session_interface.h"
 #include "wire/error.h"
 
@@ -27,7 +28,7 @@ class FlushCounters {
                 const std::optional<wire::ReportingError>& error);
 
  private:
-  Mutex _mutex FLUSH_COUNTERS_LOCK{LockRank::flushCounters};
+  Mutex _mutex FLUSH_COUNTERS_LOCK;
 };
 
 }  // namespace veltrad::session

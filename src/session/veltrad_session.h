@@ -15,6 +15,7 @@
 #include "platform/clock.h"
 #include "platform/limited_line.h"
 #include "session/backend_set.h"
+#include "session/lock_ranks.h"
 #include "wire/client_session_interface.h"
 
 namespace veltrad::ipc {
@@ -153,7 +154,7 @@ class VeltradSession final : public wire::ClientSessionInterface,
   std::atomic<std::uint32_t> _sessionID{0};
   std::atomic<bool> _hasAggregator{false};
 
-  mutable Mutex _mutex SESSION_LOCK{LockRank::session};
+  mutable Mutex _mutex SESSION_LOCK;
   std::shared_ptr<ipc::Connection> _connection GUARDED_BY(_mutex);
   backends::SharedDictionary _sessionInfo GUARDED_BY(_mutex);
   backends::SharedDictionary _userInfo GUARDED_BY(_mutex);

@@ -20,5 +20,10 @@ ReportingError makeReportingError(std::string description, std::int64_t code);
 
 // On the wire: {"domain", "code", "description"}.
 Dictionary dictionaryOfError(const ReportingError& error);
+// What is missing or of another type is empty.
+ReportingError errorOfDictionary(const Dictionary& dictionary);
+
+// Of a call whose callback the daemon let go without calling it.
+inline constexpr const char* kNoReplyDescription = "The daemon gave no reply.";
 
 }  // namespace veltrad::wire

@@ -13,7 +13,7 @@ TEST(ConnectionEnd, ADaemonThatDoesNotReadFillsTheQueueAndLosesNothingThatWasAcc
   Gate reading;
   std::atomic<unsigned> received{0};
   FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-    if (call.op() != kSend) return reading.pass();
+    if (call.op() != operation::kSendMessage) return reading.pass();
     EXPECT_EQ(call.args().uint16("type"), received);
     ++received;
     answerPlainly(link, call);
@@ -80,8 +80,9 @@ TEST(ConnectionEnd, ClosingWritesOutWhatWaitsAndEndsWhatIsUnanswered) {
   Gate reading;
   Journal ended;
   Journal received;
-  FakeDaemon daemon(
-      [&](WireEnd&, const Received& call) { call.op() == kSend ? received.add("") : reading.pass(); });
+  FakeDaemon daemon([&](WireEnd&, const Received& call) {
+    call.op() == operation::kSendMessage ? received.add("") : reading.pass();
+  });
   veltra::Session session = open(daemon);
   const auto payload = bulk(20'000);
   std::size_t accepted = 0;

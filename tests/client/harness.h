@@ -70,9 +70,10 @@ inline std::string replyFrame(std::uint32_t callID, Dictionary results) {
 inline void answerPlainly(WireEnd& link, const Received& call) {
   if (call.callID == 0) return;
   const Dictionary args = call.args();
-  const std::string text = call.op() == kSend ? std::to_string(*args.uint16("category")) + "/" +
-                                                    std::to_string(*args.uint16("type"))
-                                              : call.op();
+  const std::string text =
+      call.op() == operation::kSendMessage
+          ? std::to_string(*args.uint16("category")) + "/" + std::to_string(*args.uint16("type"))
+          : call.op();
   link.send(replyFrame(call.callID, {{"reply", text}, {"backends", Array{"dashboard", "httppost"}}}));
 }
 

@@ -4,8 +4,6 @@
 namespace veltrad::client_test {
 namespace {
 
-constexpr const char* kAggregated = "sendMessageToClient:timestamp:category:type:payload:";
-
 std::string eventFrame(const char* op, Dictionary args) {
   return wire::makeFrame(wire::FrameKind::event, 0, {{"op", op}, {"args", std::move(args)}});
 }
@@ -14,15 +12,15 @@ TEST(Session, CarriesAWholeConversation) {
   Journal calls;
   FakeDaemon daemon([&](WireEnd& link, const Received& call) {
     calls.add(call.op() + (call.callID == 0 ? " without reply " : " ") + formats::writeJSON(call.args()));
-    if (call.op() != "flushMessagesWithCompletion:") return answerPlainly(link, call);
+    if (call.op() != operation::kFlushMessages) return answerPlainly(link, call);
     // In one write with the answer, so that the waiting thread finds them.
     const Dictionary args{{"sessionInfo", Dictionary{{"sessionID", 8}}},
                           {"timestamp", 12.25},
                           {"category", 65535},
                           {"type", 2},
                           {"payload", Dictionary{{"k", Array{1, "two"}}}}};
-    link.send(eventFrame(kAggregated, args) + eventFrame("somethingElse:", {}) + eventFrame(kAggregated, {}) +
-              replyFrame(call.callID, {}));
+    link.send(eventFrame(wire::event::kSendMessageToClient, args) + eventFrame("somethingElse:", {}) +
+              eventFrame(wire::event::kSendMessageToClient, {}) + replyFrame(call.callID, {}));
   });
   Journal copies;
   const auto copied = [&](const veltra::Aggregated& copy) {
@@ -84,7 +82,7 @@ TEST(Session, CarriesCallsOutInTheOrderInWhichTheyWereMadeAndGivesEachItsOwnAnsw
   std::optional<Received> kept;
   // Answers in pairs, the later one first; every third call asks for no answer.
   FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-    if (call.op() != kSend) return;
+    if (call.op() != operation::kSendMessage) return;
     order.push_back(*call.args().uint16("type"));
     if (call.callID == 0) return;
     if (!kept) return void(kept = call);
@@ -118,7 +116,8 @@ TEST(Session, ServesThreadsThatWaitAndCallbacksAndEventsAtTheSameTime) {
   constexpr int kThreads = 6;
   constexpr int kRounds = 200;
   FakeDaemon daemon([](WireEnd& link, const Received& call) {
-    if (call.callID != 0 && call.callID % 5 == 0) link.send(eventFrame(kAggregated, {}));
+    if (call.callID != 0 && call.callID % 5 == 0)
+      link.send(eventFrame(wire::event::kSendMessageToClient, {}));
     answerPlainly(link, call);
   });
   std::atomic<int> events{0};

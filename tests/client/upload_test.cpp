@@ -22,7 +22,7 @@ TEST(Upload, DescriptorsThatWaitTravelWithTheirFrames) {
   int ends[2];
   ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
   const FileDescriptor out(ends[0]), in(ends[1]);
-  client::OutFrames frames;
+  client::OutFrames frames(1u << 20);
   std::uint32_t queued = 0;
   const auto put = [&](const std::shared_ptr<client::UploadedFile>& lent) {
     const Dictionary body{{"bulk", Data{std::string(30'000, 'b')}}};
@@ -60,8 +60,9 @@ TEST(Upload, RemovesForThoseWhoAskForNoAnswerAndOnlyWhatTheCallLent) {
     if (call.callID == 0) return;
     const std::string path = *call.args().string("path");
     const std::uint32_t named = path.ends_with("kept") ? call.callID + 1 : call.callID;
-    link.send(wire::makeFrame(wire::FrameKind::event, 0,
-                              {{"op", "removeUploadedFile:"}, {"args", Dictionary{{"call", named}}}}));
+    link.send(
+        wire::makeFrame(wire::FrameKind::event, 0,
+                        {{"op", wire::event::kRemoveUploadedFile}, {"args", Dictionary{{"call", named}}}}));
     link.send(replyFrame(call.callID, {{"uploaded", true}}));
   });
   veltra::Session session = open(daemon);

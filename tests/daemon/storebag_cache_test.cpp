@@ -9,6 +9,7 @@
 
 #include "config/storebag_content.h"
 #include "config/storebag_source.h"
+#include "daemon/lock_ranks.h"
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 
@@ -69,7 +70,7 @@ class Cache : public ::testing::Test {
   daemon::StorebagCache cache{source, clock};
 
  private:
-  RecursiveMutex _lock AGENT_LOCK{LockRank::agent};
+  RecursiveMutex _lock STOREBAG_CACHE_LOCK;
 };
 
 // Nothing is recorded, so the next session asks again at once.

@@ -20,12 +20,12 @@
 #include "formats/json.h"
 #include "platform/root.h"
 #include "wire/frame.h"
+#include "wire/names.h"
 
 namespace veltrad {
 
-using wire::FrameKind;
+namespace operation = wire::operation;
 inline constexpr std::chrono::seconds kPatience{20};
-inline constexpr const char* kSend = "sendMessageWithCategory:type:payload:reply:";
 
 // What happened, in order. Any thread.
 class Journal {

@@ -14,12 +14,12 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
       {rawFrame(wire::FrameKind::call, writeBinaryPropertyList(Array{1})), "the body must be a dictionary"},
       {wire::makeFrame(wire::FrameKind::call, 9, {{"args", Dictionary{}}}), "\"op\" must be a text"},
       {call("launch:", {}), "unknown operation \"launch:\""},
-      {call(kSend, {{"category", "5"}, {"type", 1}}), "argument \"category\" must be a number"},
-      {call(kSend, {{"category", 5}}), "argument \"type\" must be a number"},
-      {call("sendMessageWithDictionary:reply:", {{"message", 1}}),
-       "argument \"message\" must be a dictionary"},
-      {call(kOneShot, {{"type", 1}}), "argument \"category\" must be a number"},
-      {callFrame(9, kSend, {}, wire::FrameKind::largeCall),
+      {call(operation::kSendMessage, {{"category", "5"}, {"type", 1}}),
+       "argument \"category\" must be a number"},
+      {call(operation::kSendMessage, {{"category", 5}}), "argument \"type\" must be a number"},
+      {call(operation::kSendDictionary, {{"message", 1}}), "argument \"message\" must be a dictionary"},
+      {call(operation::kSendOneShot, {{"type", 1}}), "argument \"category\" must be a number"},
+      {callFrame(9, operation::kSendMessage, {}, wire::FrameKind::largeCall),
        "a large call is for \"uploadLogData:completionHandler:\" alone"},
       {rawFrame(wire::FrameKind::reply, writeBinaryPropertyList(Dictionary{})), "not of kind 3"},
       {rawFrame(static_cast<wire::FrameKind>(200), ""), "not of kind 200"},
@@ -35,8 +35,8 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
   }
   // Without a call id nothing comes back, and what follows is served.
   // Numbers come as they fit; what may be absent and is of another type counts as absent.
-  client.send(callFrame(0, "launch:") +
-              callFrame(10, kSend, {{"category", 65'543}, {"type", 2.9}, {"payload", "x"}}));
+  client.send(callFrame(0, "launch:") + callFrame(10, operation::kSendMessage,
+                                                  {{"category", 65'543}, {"type", 2.9}, {"payload", "x"}}));
   EXPECT_EQ(client.next().callID, 10u);
   std::vector<std::string> expected(cases.size() + 1, "interrupted");
   expected.push_back("sendMessage 7 2 none");

@@ -65,7 +65,7 @@ TEST(Connection, TakesADescriptorWithItsFrameAndKeepsNone) {
   Pipe first;
   Pipe second;
   const auto frame = [](std::uint32_t id) {
-    return callFrame(id, kUploadFile, {{"path", "/a"}}, wire::FrameKind::call, 1);
+    return callFrame(id, operation::kUploadFile, {{"path", "/a"}}, wire::FrameKind::call, 1);
   };
   client.send(frame(1), {first.write.get()});
   EXPECT_EQ(client.next().results(), R"({"uploaded":true})");
@@ -178,8 +178,9 @@ TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {
   platform::MemoryBounds bounds;
   bounds.userUnfinished = 2u << 20;
   Door door(4096, 1024, bounds);
-  const std::string most = callFrame(
-      1, kSend, {{"category", 1}, {"type", 1}, {"payload", Dictionary{{"x", std::string(900'000, 'x')}}}});
+  const std::string most =
+      callFrame(1, operation::kSendMessage,
+                {{"category", 1}, {"type", 1}, {"payload", Dictionary{{"x", std::string(900'000, 'x')}}}});
   WireEnd boasting = door.client();  // what a header declares holds nothing
   boasting.send(rawFrame(wire::FrameKind::largeCall, "", wire::kLargeFrameBodyLimit));
   boasting.waitUntilRead();

@@ -15,10 +15,6 @@ namespace veltrad::ipc_test {
 using namespace std::chrono_literals;
 using ::testing::HasSubstr;
 
-inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
-inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
-inline constexpr const char* kOneShot = "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
-
 inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds time) {
   return std::chrono::steady_clock::now() + time;
 }
@@ -67,7 +63,7 @@ inline std::string callFrame(std::uint32_t id, const char* op, Dictionary argume
   return wire::makeFrame(kind, id, Dictionary{{"op", op}, {"args", std::move(arguments)}}, descriptors);
 }
 inline std::string messageFrame(std::uint32_t id, int category = 1, int type = 1) {
-  return callFrame(id, kSend, {{"category", category}, {"type", type}});
+  return callFrame(id, operation::kSendMessage, {{"category", category}, {"type", type}});
 }
 inline std::string helloFrame(Value wire = 1) {
   return wire::makeFrame(wire::FrameKind::hello, 0,

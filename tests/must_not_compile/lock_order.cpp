@@ -1,14 +1,18 @@
 // Takes two locks in the order of their ranks; with WRONG_ORDER defined, in the other one, and must not
 // compile.
-#include "base/mutex.h"
+#include "daemon/lock_ranks.h"
+#include "session/lock_ranks.h"
 
 namespace {
 
-struct Agent {
-  veltrad::Mutex lock AGENT_LOCK{veltrad::LockRank::agent};
+struct Cache {
+  veltrad::Mutex lock STOREBAG_CACHE_LOCK;
+};
+struct Families {
+  veltrad::Mutex lock FAMILIES_LOCK;
 };
 struct Session {
-  veltrad::Mutex lock SESSION_LOCK{veltrad::LockRank::session};
+  veltrad::Mutex lock SESSION_LOCK;
 };
 struct Leaf {
   veltrad::Mutex lock LEAF_LOCK{veltrad::LockRank::leaf};
@@ -17,19 +21,20 @@ struct Leaf {
 }  // namespace
 
 #ifndef WRONG_ORDER
-void inOrder(Agent& agent, Session& session, Leaf& leaf) {
-  const veltrad::Lock first(agent.lock);
-  const veltrad::Lock second(session.lock);
-  const veltrad::Lock third(leaf.lock);
+void inOrder(Cache& cache, Families& families, Session& session, Leaf& leaf) {
+  const veltrad::Lock first(cache.lock);
+  const veltrad::Lock second(families.lock);
+  const veltrad::Lock third(session.lock);
+  const veltrad::Lock fourth(leaf.lock);
 }
 #elif WRONG_ORDER == 1
-void sessionThenAgent(Agent& agent, Session& session) {
-  const veltrad::Lock first(session.lock);
-  const veltrad::Lock second(agent.lock);
+void familiesThenCache(Cache& cache, Families& families) {
+  const veltrad::Lock first(families.lock);
+  const veltrad::Lock second(cache.lock);
 }
 #else
-void leafThenAgent(Agent& agent, Leaf& leaf) {
+void leafThenSession(Session& session, Leaf& leaf) {
   const veltrad::Lock first(leaf.lock);
-  const veltrad::Lock second(agent.lock);
+  const veltrad::Lock second(session.lock);
 }
 #endif

@@ -14,6 +14,7 @@
 #include "backends/dashboard/pool_timer.h"
 #include "backends/dashboard/read_source.h"
 #include "backends/dashboard/udp_socket.h"
+#include "backends/lock_ranks.h"
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
 
@@ -77,7 +78,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   const std::shared_ptr<platform::MemoryAccount> _account;
   const std::shared_ptr<DashboardQueues> _queues;
 
-  Mutex _mutex BACKEND_LOCK{LockRank::backend};
+  Mutex _mutex BACKEND_LOCK;
   UDPSocket _socket GUARDED_BY(_mutex);
   MessageQueue _messageQueue GUARDED_BY(_mutex);
   DeliverySchedule _schedule GUARDED_BY(_mutex);

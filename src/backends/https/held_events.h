@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "backends/https/event_batch.h"
+#include "backends/lock_ranks.h"
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
 
@@ -58,7 +59,7 @@ class HeldEvents final : public platform::Evictable {
   platform::Counters& _counters;
   std::atomic<std::uint64_t> _sessionIDChanges{0};
 
-  mutable Mutex _mutex BACKEND_LOCK{LockRank::backend};
+  mutable Mutex _mutex BACKEND_LOCK;
   EventBatch _batch GUARDED_BY(_mutex);
   platform::Charge _charge GUARDED_BY(_mutex);
   std::string _sessionID GUARDED_BY(_mutex);  // since the first change

@@ -58,7 +58,7 @@ class UploadBackend final : public VeltraBackend {
   platform::LentFiles& _lentFiles;
   const std::string _scratchDirectory;
 
-  mutable Mutex _urlMutex BACKEND_LOCK{LockRank::backend};
+  mutable Mutex _urlMutex BACKEND_LOCK;
   std::optional<std::string> _uploadURL GUARDED_BY(_urlMutex);
 };
 

@@ -27,7 +27,7 @@ std::string formatBackends(const std::optional<std::vector<std::string>>& backen
   return text + ']';
 }
 
-std::string formatError(const std::optional<AnswerError>& error) {
+std::string formatError(const std::optional<wire::ReportingError>& error) {
   if (!error) return "null";
   return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", quoted(error->domain), error->code,
                      quoted(error->description));
@@ -38,7 +38,7 @@ std::string formatError(const std::optional<AnswerError>& error) {
 Answer answerOfFailure(veltra_status status) {
   Answer answer;
   answer.status = status;
-  answer.error = AnswerError{"com.florn.veltra.error", -1, veltra_status_text(status)};
+  answer.error = wire::makeReportingError(veltra_status_text(status), -1);
   return answer;
 }
 

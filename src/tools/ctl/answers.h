@@ -11,20 +11,15 @@
 #include "base/value.h"
 #include "tools/ctl/operation.h"
 #include "veltra/veltra.h"
+#include "wire/error.h"
 
 namespace veltrad::ctl {
-
-struct AnswerError {
-  std::string domain;
-  std::int64_t code = -1;
-  std::string description;
-};
 
 struct Answer {
   veltra_status status = VELTRA_OK;  // anything else: the call ended without an answer, and `error` says why
   std::optional<std::string> reply;
   std::optional<std::vector<std::string>> backends;
-  std::optional<AnswerError> error;
+  std::optional<wire::ReportingError> error;
   bool uploaded = false;
   bool removed = false;  // an uploaded file
 };

@@ -34,7 +34,8 @@ Answer answerOf(const veltra_reply* reply) {
   answer.removed = veltra_reply_removed(reply);
   const char* domain = veltra_reply_error_domain(reply);
   const char* description = veltra_reply_error_description(reply);
-  if (domain && description) answer.error = AnswerError{domain, veltra_reply_error_code(reply), description};
+  if (domain && description)
+    answer.error = wire::ReportingError{domain, veltra_reply_error_code(reply), description};
   if (answer.status != VELTRA_OK && !answer.error) answer.error = answerOfFailure(answer.status).error;
   return answer;
 }

@@ -12,6 +12,7 @@
 #include "base/text.h"
 #include "tools/ctl/key_value.h"
 #include "veltra/veltra.h"
+#include "wire/constants.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -256,8 +257,8 @@ void putTogether(const Texts& texts, Options& options) {
   if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
   if (!texts.client && !texts.service && texts.userInfo.empty()) return;
   Dictionary userInfo = parseKeyValues(texts.userInfo).value();
-  userInfo.setIfPresent("clientName", texts.client);
-  userInfo.setIfPresent("serviceName", texts.service);
+  userInfo.setIfPresent(wire::kVeltraUserInfoClientName, texts.client);
+  userInfo.setIfPresent(wire::kVeltraUserInfoServiceName, texts.service);
   options.identity.userInfo = std::move(userInfo);
 }
 

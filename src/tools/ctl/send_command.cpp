@@ -4,6 +4,8 @@
 
 #include <fmt/format.h>
 
+#include <cstdlib>
+
 #include "platform/file_store.h"
 #include "tools/ctl/client_session.h"
 #include "tools/ctl/given_values.h"
@@ -16,21 +18,6 @@ namespace {
 // Twice what the largest call has: JSON is the longer form.
 constexpr std::size_t kLargestFile = 128u << 20;
 
-Operation operationOf(Command command) {
-  switch (command) {
-    case Command::states:
-      return Operation::states;
-    case Command::displayURL:
-      return Operation::displayURL;
-    case Command::upload:
-      return Operation::uploadFile;
-    case Command::uploadLogData:
-      return Operation::uploadLogData;
-    default:
-      return Operation::send;
-  }
-}
-
 Result<Array, std::string> readLogData(const std::string& path) {
   const auto bytes = platform::DiskFileStore().read(path, kLargestFile);
   if (!bytes) return Failure{bytes.error().description};
@@ -39,19 +26,31 @@ Result<Array, std::string> readLogData(const std::string& path) {
   return data;
 }
 
-std::optional<Answer> call(ClientSession& session, const Options& options, const Array& logData) {
-  switch (operationOf(options.command)) {
-    case Operation::states:
-      return session.states(options.identity.userInfo);
-    case Operation::displayURL:
-      return session.displayURL();
-    case Operation::uploadFile:
-      return session.uploadFile(options.file, uploadProgress(options.file));
-    case Operation::uploadLogData:
-      return session.uploadLogData(logData);
-    default:
-      return session.send(options.category, options.type, options.payload, options.flag);
+struct Called {
+  Operation operation;
+  std::optional<Answer> answer;  // nothing: the user has interrupted it
+};
+
+Called call(ClientSession& session, const Options& options, const Array& logData) {
+  switch (options.command) {
+    case Command::send:
+      return {Operation::send, session.send(options.category, options.type, options.payload, options.flag)};
+    case Command::oneShot:
+      return {Operation::oneShot,
+              session.sendOneShot(options.identity, options.category, options.type, options.payload)};
+    case Command::states:
+      return {Operation::states, session.states(options.identity.userInfo)};
+    case Command::displayURL:
+      return {Operation::displayURL, session.displayURL()};
+    case Command::upload:
+      return {Operation::uploadFile, session.uploadFile(options.file, uploadProgress(options.file))};
+    case Command::uploadLogData:
+      return {Operation::uploadLogData, session.uploadLogData(logData)};
+    case Command::session:
+    case Command::stats:
+      break;
   }
+  std::abort();  // these are no single calls
 }
 
 // Says why there is no answer.
@@ -60,7 +59,8 @@ int failed(const std::optional<Answer>& answer) {
   return 1;
 }
 
-int finish(Operation operation, const Options& options, const std::optional<Answer>& answer) {
+int finish(const Options& options, const Called& called) {
+  const auto& [operation, answer] = called;
   if (!answer) return failed(answer);
   if (!printLine(formatAnswer(operation, *answer))) return 1;
   if (answer->status != VELTRA_OK) return failed(answer);
@@ -70,20 +70,10 @@ int finish(Operation operation, const Options& options, const std::optional<Answ
   return 1;
 }
 
-int runOneShot(const Options& options, ClientSession& session) {
-  if (const auto problem = session.openUndescribed(options.root)) {
-    complain(*problem);
-    return 1;
-  }
-  return finish(Operation::oneShot, options,
-                session.sendOneShot(options.identity, options.category, options.type, options.payload));
-}
-
 }  // namespace
 
 int runOneCall(const Options& options, Interrupt& interrupt) {
   ClientSession session(interrupt);
-  if (options.command == Command::oneShot) return runOneShot(options, session);
   Array logData;
   if (options.command == Command::uploadLogData) {
     auto read = readLogData(options.file);
@@ -93,15 +83,19 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
     }
     logData = std::move(read).value();
   }
-  if (const auto problem = session.open(options.root, options.identity)) {
+  const bool oneShot = options.command == Command::oneShot;
+  if (const auto problem =
+          oneShot ? session.openUndescribed(options.root) : session.open(options.root, options.identity)) {
     complain(*problem);
     return 1;
   }
-  const auto started = session.start();
-  if (!started || started->status != VELTRA_OK) return failed(started);
-  if (!started->backends)
-    complain("Nothing reports for this client: the daemon has no configuration for its client type.");
-  return finish(operationOf(options.command), options, call(session, options, logData));
+  if (!oneShot) {
+    const auto started = session.start();
+    if (!started || started->status != VELTRA_OK) return failed(started);
+    if (!started->backends)
+      complain("Nothing reports for this client: the daemon has no configuration for its client type.");
+  }
+  return finish(options, call(session, options, logData));
 }
 
 }  // namespace veltrad::ctl

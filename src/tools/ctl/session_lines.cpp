@@ -5,6 +5,7 @@
 
 #include "formats/json.h"
 #include "tools/ctl/given_values.h"
+#include "wire/constants.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -28,8 +29,9 @@ bool isInteger(const Value& value) {
 }
 
 Result<SessionLine, std::string> parseSend(Dictionary line) {
-  if (auto problem = objectProblem(Operation::send, line, "payload")) return Failure{*problem};
-  const Value* flag = line.find("flag");
+  if (auto problem = objectProblem(Operation::send, line, wire::kVeltraMessageParametersPayload))
+    return Failure{*problem};
+  const Value* flag = line.find(wire::kVeltraMessageParametersFlag);
   if (flag && !isInteger(*flag)) {
     return Failure{fmt::format("\"flag\" of send: expected an integer, found {}", typeName(*flag))};
   }

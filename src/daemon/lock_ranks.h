@@ -1,0 +1,8 @@
+// Where the locks of this room stand in the order of all (base/mutex.h).
+#pragma once
+
+#include "base/mutex.h"
+
+#define SESSION_LIST_LOCK LOCK_OF_RANK(10)
+#define STOREBAG_CACHE_LOCK LOCK_OF_RANK(20)
+#define FAMILIES_LOCK LOCK_OF_RANK(30)

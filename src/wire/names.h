@@ -1,0 +1,63 @@
+// The words of frames (docs/wire-protocol.md): operations, events and keys, the same for both ends.
+#pragma once
+
+namespace veltrad::wire {
+
+// What a client calls.
+namespace operation {
+inline constexpr const char* kFetchDisplayURL = "fetchDisplayURL:";
+inline constexpr const char* kFetchStates = "fetchStatesWithUserInfo:completionHandler:";
+inline constexpr const char* kFinishSession = "finishSessionWithReply:";
+inline constexpr const char* kFlushMessages = "flushMessagesWithCompletion:";
+inline constexpr const char* kSendDictionary = "sendMessageWithDictionary:reply:";
+inline constexpr const char* kSendMessage = "sendMessageWithCategory:type:payload:reply:";
+inline constexpr const char* kSendOneShot =
+    "sendMessageWithSessionInfo:userInfo:category:type:payload:reply:";
+inline constexpr const char* kSetSessionInfo =
+    "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:";
+inline constexpr const char* kStartConfig = "startConfigWithCompletionHandler:";
+inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:completionHandler:";
+inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
+}  // namespace operation
+
+// What the daemon calls.
+namespace event {
+inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";
+inline constexpr const char* kSendMessageToClient = "sendMessageToClient:timestamp:category:type:payload:";
+}  // namespace event
+
+namespace key {
+// Of a hello.
+inline constexpr const char* kDaemon = "daemon";
+inline constexpr const char* kLibrary = "library";
+inline constexpr const char* kWire = "wire";
+
+// Of a call or an event.
+inline constexpr const char* kArguments = "args";
+inline constexpr const char* kOperation = "op";
+
+// Of a reply; the error in a refusal and in the results, too.
+inline constexpr const char* kError = "error";
+inline constexpr const char* kResults = "results";
+
+// Arguments. A call with a category, a type and a payload of its own names them like a message dictionary.
+inline constexpr const char* kCall = "call";
+inline constexpr const char* kCategory = "category";
+inline constexpr const char* kData = "data";
+inline constexpr const char* kFrameworksToCheck = "frameworksToCheck";
+inline constexpr const char* kHasAggregationBlock = "hasAggregationBlock";
+inline constexpr const char* kMessage = "message";
+inline constexpr const char* kPath = "path";
+inline constexpr const char* kPayload = "payload";
+inline constexpr const char* kSessionInfo = "sessionInfo";
+inline constexpr const char* kTimestamp = "timestamp";
+inline constexpr const char* kType = "type";
+inline constexpr const char* kUserInfo = "userInfo";
+
+// Results.
+inline constexpr const char* kBackends = "backends";
+inline constexpr const char* kReply = "reply";
+inline constexpr const char* kUploaded = "uploaded";
+}  // namespace key
+
+}  // namespace veltrad::wire

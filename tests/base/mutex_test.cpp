@@ -1,0 +1,54 @@
+// The order of locks as it is checked at run time, in debug builds alone.
+#include "base/mutex.h"
+
+#include <gtest/gtest.h>
+
+namespace veltrad {
+namespace {
+
+#ifndef NDEBUG
+
+// Clang refuses the wrong orders where it sees them.
+void takeBoth(Mutex& first, Mutex& second) NO_THREAD_SAFETY_ANALYSIS {
+  first.lock();
+  second.lock();
+  second.unlock();
+  first.unlock();
+}
+
+void takeBoth(LockRank firstRank, LockRank secondRank) {
+  Mutex first{firstRank};
+  Mutex second{secondRank};
+  takeBoth(first, second);
+}
+
+TEST(LockOrderDeathTest, aLockOfNoHigherRankAborts) {
+  constexpr LockRank kLow{10}, kHigh{20}, kAboveLeaves{101};
+  takeBoth(kLow, kHigh);
+  takeBoth(kHigh, LockRank::leaf);
+  takeBoth(LockRank::leaf, kAboveLeaves);
+  EXPECT_DEATH(takeBoth(kHigh, kLow), "lock order: a lock of rank 10 is wanted while one of rank 20 is held");
+  EXPECT_DEATH(takeBoth(kLow, kLow), "a lock of rank 10 is wanted while one of rank 10 is held");
+  EXPECT_DEATH(takeBoth(kAboveLeaves, LockRank::leaf), "a lock of rank 100 is wanted while one of rank 101");
+}
+
+void takeAgain(RecursiveMutex& mutex, Mutex& above) NO_THREAD_SAFETY_ANALYSIS {
+  mutex.lock();
+  above.lock();
+  mutex.lock();
+  mutex.unlock();
+  above.unlock();
+  mutex.unlock();
+}
+
+TEST(LockOrderDeathTest, aThreadMayTakeItsRecursiveLockAgainUnderAnother) {
+  RecursiveMutex mutex{LockRank{10}};
+  Mutex above{LockRank{20}};
+  takeAgain(mutex, above);
+  takeBoth(LockRank{5}, LockRank{10});  // all of them were let go
+}
+
+#endif
+
+}  // namespace
+}  // namespace veltrad
