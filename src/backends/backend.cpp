@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <utility>
 
+#include "base/text.h"
 #include "platform/random.h"
 
 namespace veltrad::backends {
@@ -17,14 +18,7 @@ std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
   unsigned char digest[32];
   unsigned length = 0;
   if (EVP_Digest(text.data(), text.size(), digest, &length, EVP_sha256(), nullptr) != 1) std::abort();
-  static const char digits[] = "0123456789abcdef";
-  std::string hexadecimal;
-  hexadecimal.reserve(64);
-  for (const unsigned char byte : digest) {
-    hexadecimal += digits[byte >> 4];
-    hexadecimal += digits[byte & 15];
-  }
-  return hexadecimal;
+  return hex({reinterpret_cast<const char*>(digest), length});
 }
 
 void VeltraBackend::updateState() {

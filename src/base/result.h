@@ -15,6 +15,9 @@ struct Failure {
 template <typename E>
 Failure(E) -> Failure<E>;
 
+// The value of a Result that has nothing to give but that all went well.
+struct Done {};
+
 // Asking for the side that is not there is a broken invariant and aborts. A refusal is handled by its direct
 // caller; it is not passed on unread.
 template <typename T, typename E>

@@ -46,15 +46,6 @@ bool isSecond(std::uint8_t first, std::uint8_t second) {
   }
 }
 
-void appendHex(std::string& out, std::string_view bytes) {
-  constexpr char kHex[] = "0123456789ABCDEF";
-  for (std::size_t i = 0; i < bytes.size(); ++i) {
-    out += "\\x";
-    out += kHex[byteAt(bytes, i) >> 4];
-    out += kHex[byteAt(bytes, i) & 0xF];
-  }
-}
-
 bool isControl(char32_t code) {
   return code < 0x20 || (code >= 0x7F && code <= 0x9F) || code == 0x2028 || code == 0x2029;
 }
@@ -141,7 +132,6 @@ bool containsIgnoringCase(std::string_view text, std::string_view part) {
 }
 
 std::string percentEncoded(std::string_view text, std::string_view kept) {
-  constexpr std::string_view kDigits = "0123456789ABCDEF";
   constexpr std::string_view kUnreserved =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~";
   std::string encoded;
@@ -149,14 +139,25 @@ std::string percentEncoded(std::string_view text, std::string_view kept) {
     if (kUnreserved.find(c) != std::string_view::npos || kept.find(c) != std::string_view::npos) {
       encoded += c;
     } else {
-      const auto byte = static_cast<unsigned char>(c);
-      encoded += {'%', kDigits[byte >> 4], kDigits[byte & 15]};
+      encoded += '%' + hex({&c, 1}, kUpperCaseDigits);
     }
   }
   return encoded;
 }
 
+std::string hex(std::string_view bytes, const char* digits) {
+  std::string text;
+  text.reserve(2 * bytes.size());
+  for (std::size_t i = 0; i < bytes.size(); ++i) {
+    text += digits[byteAt(bytes, i) >> 4];
+    text += digits[byteAt(bytes, i) & 0xF];
+  }
+  return text;
+}
+
 std::string escapedForLog(std::string_view text) {
+  const auto plain = [](char c) { return c >= 0x20 && c < 0x7F && c != '\\'; };
+  if (std::all_of(text.begin(), text.end(), plain)) return std::string(text);  // nearly always
   std::string out;
   out.reserve(text.size());
   for (std::size_t i = 0; i < text.size();) {
@@ -164,7 +165,7 @@ std::string escapedForLog(std::string_view text) {
     const std::size_t length = std::max<std::size_t>(character.length, 1);
     const std::string_view bytes = text.substr(i, length);
     if (character.length == 0 || isControl(character.code)) {
-      appendHex(out, bytes);
+      for (const char& byte : bytes) out += "\\x" + hex({&byte, 1}, kUpperCaseDigits);
     } else {
       out += bytes;
       if (character.code == '\\') out += '\\';

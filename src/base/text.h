@@ -52,6 +52,10 @@ bool containsIgnoringCase(std::string_view text, std::string_view part);
 // Keeps letters, digits, "-._~" and what `kept` holds, all ASCII; each other byte becomes "%" and two digits.
 std::string percentEncoded(std::string_view text, std::string_view kept);
 
+inline constexpr const char* kUpperCaseDigits = "0123456789ABCDEF";
+// Two hexadecimal digits a byte: "0a3f".
+std::string hex(std::string_view bytes, const char* digits = "0123456789abcdef");
+
 // For one log line: valid UTF-8 stays; controls, DEL, C1 controls, U+2028, U+2029 and bytes that are no UTF-8
 // become \xNN for each byte; a backslash is doubled.
 std::string escapedForLog(std::string_view text);

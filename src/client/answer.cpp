@@ -2,6 +2,7 @@
 #include "client/answer.h"
 
 #include "base/property_list.h"
+#include "base/version.h"
 #include "wire/constants.h"
 #include "wire/limits.h"
 #include "wire/names.h"
@@ -127,5 +128,5 @@ const char* veltra_status_text(veltra_status status) {
 }
 
 const char* veltra_version(void) {
-  return "8.0";
+  return veltrad::kVersion;
 }

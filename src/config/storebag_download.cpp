@@ -33,22 +33,21 @@ std::int32_t leadingInteger(std::string_view text) {
   return static_cast<std::int32_t>(negative ? -number : std::min(number, kMost));
 }
 
-http::HTTPRequest requestForStorebag(std::string url, const std::optional<std::string>* lastModified) {
+http::HTTPRequest requestForStorebag(std::string url, const std::optional<std::string>& lastModified) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::get;
   request.lane = http::HTTPRequest::Lane::storebag;
   request.url = std::move(url);
   request.timeout = kStorebagTimeout;
   request.mostResponseBytes = kStorebagMostContainerBytes;
-  if (lastModified != nullptr && *lastModified) {
-    logDebug("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header", (*lastModified)->c_str());
-    request.headers.emplace_back("If-Modified-Since", **lastModified);
+  if (lastModified) {
+    logDebug("fetchStorebagWithName: Adding 'Last-Modified: %s' to the header", lastModified->c_str());
+    request.headers.emplace_back("If-Modified-Since", *lastModified);
   }
   return request;
 }
 
-// True when the server says that the cached storebag is current; otherwise the slot has taken the answer's
-// text.
+// True when the server says that the copy is current; otherwise the text has become the answer's.
 bool isNotModified(const http::HTTPResponse& response, std::optional<std::string>& lastModified) {
   const std::optional<std::string_view> header = response.header("Last-Modified");
   if (!header) return false;
@@ -61,9 +60,6 @@ bool isNotModified(const http::HTTPResponse& response, std::optional<std::string
   return false;
 }
 
-}  // namespace
-
-namespace {
 // All lines of the header as one.
 std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   std::optional<std::string> all;
@@ -72,6 +68,7 @@ std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   }
   return all;
 }
+
 }  // namespace
 
 std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl) {
@@ -99,69 +96,82 @@ StorebagDownload::StorebagDownload(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _http(http), _settings(settings), _veltra(veltra) {}
 
-std::optional<Dictionary> StorebagDownload::fetchStorebagWithName(const std::string& name,
-                                                                  std::int32_t& maxAge, bool& notModified,
-                                                                  std::optional<std::string>* lastModified,
-                                                                  bool& attempted) {
+WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& name,
+                                                            const std::optional<std::string>& lastModified) {
+  WholeStorebagAnswer answer;
+  const auto without = [&](const std::string& server, const http::HTTPError& error) {
+    answer = withoutAnswer(name, server, error);
+    answer.lastModified = lastModified;
+    return answer;
+  };
   const std::optional<std::string> server = _settings.storebagServerURL();
   const auto version = _veltra.statedVersion();
   if (!server || !version) {
     const std::string why = version ? "its address cannot be read just now" : version.error().description;
-    return withoutAnswer(name, "(null)", {http::HTTPError::Kind::shortage, why}, maxAge, attempted);
+    return without("(null)", {http::HTTPError::Kind::shortage, why});
   }
   const std::string url = *server + "/" + name + "?version=" + version.value();
   logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
-  const http::HTTPResult answer = _http.perform(requestForStorebag(url, lastModified));
-  if (!answer) return withoutAnswer(name, url, answer.error(), maxAge, attempted);
-  const http::HTTPResponse& response = answer.value();
-  maxAge = maxAgeOfCacheControl(cacheControlOf(response));
-  if (lastModified != nullptr && isNotModified(response, *lastModified)) {
-    notModified = true;
-    return std::nullopt;
+  const http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
+  if (!result) return without(url, result.error());
+  const http::HTTPResponse& response = result.value();
+  answer.maxAge = maxAgeOfCacheControl(cacheControlOf(response));
+  answer.lastModified = lastModified;
+  if (isNotModified(response, answer.lastModified)) {
+    answer.kind = StorebagAnswer::Kind::notModified;
+    return answer;
   }
-  return verifiedStorebag(response.body, attempted);
+  auto storebag = verifiedStorebag(response.body);
+  answer.attempted = storebag || storebag.error() != Refusal::keyOutOfReach;
+  if (!storebag) return answer;
+  answer.kind = StorebagAnswer::Kind::fetched;
+  answer.storebag = std::move(storebag).value();
+  return answer;
 }
 
-std::optional<Dictionary> StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
-                                                          const http::HTTPError& error, std::int32_t& maxAge,
-                                                          bool& attempted) const {
+WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, const std::string& server,
+                                                    const http::HTTPError& error) const {
   using Kind = http::HTTPError::Kind;
+  WholeStorebagAnswer answer;
   if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
-    maxAge = kDefaultMaxAgeSeconds;
+    answer.maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
     logError("fetchStorebagWithName: Signature is missing");
-    return std::nullopt;
+    return answer;
   }
-  attempted = error.kind != Kind::shortage && error.kind != Kind::stopping;
+  answer.attempted = error.kind != Kind::shortage && error.kind != Kind::stopping;
   logInfo("fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
           server.c_str(), error.description.c_str());
-  if (name != kNameWithDefault || error.kind == Kind::stopping) return std::nullopt;
+  if (name != kNameWithDefault || error.kind == Kind::stopping) return answer;
   logInfo("fetchStorebagWithName: Loading default storebag '%s'", name.c_str());
-  return defaultStorebag();
+  answer.kind = StorebagAnswer::Kind::fetched;
+  answer.storebag = defaultStorebag();
+  return answer;
 }
 
-std::optional<Dictionary> StorebagDownload::verifiedStorebag(std::string_view body, bool& attempted) const {
+Result<Dictionary, StorebagDownload::Refusal> StorebagDownload::verifiedStorebag(
+    std::string_view body) const {
+  constexpr Failure<Refusal> kNotGenuine{Refusal::notGenuine};
   const auto container = parseStorebagContainer(body);
   if (!container)
     logError("fetchStorebagWithName: propertyListWithData error %s", container.error().detail.c_str());
   if (!container || !container.value().signature) {
     logError("fetchStorebagWithName: Signature is missing");
-    return std::nullopt;
+    return kNotGenuine;
   }
   const auto der = _veltra.publicKeyDER();
-  if (!der) {
-    attempted = !der.error().passes();
-    return std::nullopt;
-  }
+  if (!der) return der.error().passes() ? Failure{Refusal::keyOutOfReach} : kNotGenuine;
   const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
-  if (!key) return std::nullopt;
+  if (!key) return kNotGenuine;
   const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
-  if (!decoded) return std::nullopt;
+  if (!decoded) return kNotGenuine;
   if (!key->verifies(decoded->bag, decoded->signature)) {
     logError("fetchStorebagWithName: Signature can not be verified, %p", key->identity());
-    return std::nullopt;
+    return kNotGenuine;
   }
-  return parseStorebagBag(decoded->bag);
+  auto storebag = parseStorebagBag(decoded->bag);
+  if (!storebag) return kNotGenuine;
+  return std::move(*storebag);
 }
 
 }  // namespace veltrad::config

@@ -7,7 +7,9 @@
 #include <string>
 #include <string_view>
 
+#include "base/result.h"
 #include "base/value.h"
+#include "config/storebag_source.h"
 
 namespace veltrad::http {
 class HTTPClient;
@@ -31,26 +33,26 @@ std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl);
 // What stands in for the storebag "quindle" while its server cannot be reached.
 Dictionary defaultStorebag();
 
+struct WholeStorebagAnswer : StorebagAnswer {
+  Dictionary storebag;  // verified, where it was fetched
+};
+
 // Keeps no state between calls; any number of threads at once. What the constructor takes must outlive it.
 class StorebagDownload {
  public:
   StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  // The verified storebag, or nothing. `maxAge` (seconds) is written on every path that got an answer;
-  // `notModified` becomes true when the server says that the cached storebag is current; `lastModified` (or
-  // null), the "Last-Modified" text of the cached storebag, makes the request conditional and is replaced by
-  // a new one even when the answer then turns out not to verify. `attempted` becomes false where this was no
-  // attempt, of which nothing is to be remembered: for a shortage it could not begin, or its answer not be
-  // verified, or the daemon is stopping.
-  std::optional<Dictionary> fetchStorebagWithName(const std::string& name, std::int32_t& maxAge,
-                                                  bool& notModified, std::optional<std::string>* lastModified,
-                                                  bool& attempted);
+  // `lastModified`, the "Last-Modified" text of the copy
+  // that the caller holds, makes the request conditional.
+  WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
+                                            const std::optional<std::string>& lastModified);
 
  private:
-  std::optional<Dictionary> withoutAnswer(const std::string& name, const std::string& server,
-                                          const http::HTTPError& error, std::int32_t& maxAge,
-                                          bool& attempted) const;
-  std::optional<Dictionary> verifiedStorebag(std::string_view body, bool& attempted) const;
+  enum class Refusal { notGenuine, keyOutOfReach };
+
+  WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
+                                    const http::HTTPError& error) const;
+  Result<Dictionary, Refusal> verifiedStorebag(std::string_view body) const;
 
   http::HTTPClient& _http;
   ProcessSettings& _settings;

@@ -33,29 +33,28 @@ StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& sett
                                    const support::Veltra& veltra)
     : _settings(settings), _download(http, settings, veltra) {}
 
-std::shared_ptr<const StorebagSection> StorebagSections::fetchStorebagForEnvironmentAndClientType(
-    std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-    std::optional<std::string>* lastModified, bool& attempted) {
+StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
+    std::int32_t clientType, const std::optional<std::string>& lastModified) {
+  using Kind = StorebagAnswer::Kind;
   const char* name = storebagNameForClientType(clientType);
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return nullptr;
+    return {};
   }
-  const std::optional<Dictionary> fetched =
-      _download.fetchStorebagWithName(name, maxAge, notModified, lastModified, attempted);
-  if (!fetched) {
-    if (!notModified && attempted)
-      logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
-               clientType);
-    return nullptr;
-  }
+  const WholeStorebagAnswer whole = _download.fetchStorebagWithName(name, lastModified);
+  StorebagSectionAnswer answer{whole, nullptr, {}};
+  if (answer.kind == Kind::failed && answer.attempted)
+    logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
+             clientType);
+  if (answer.kind != Kind::fetched) return answer;
+  answer.kind = Kind::failed;
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
-    attempted = false;
-    return nullptr;
+    answer.attempted = false;
+    return answer;
   }
-  const auto storebag = parsed<Storebag>(*fetched);
+  const auto storebag = parsed<Storebag>(whole.storebag);
   const Dictionary* section = sectionOf(storebag, *environment);
   if (section == nullptr) {
     const char* sectionName = sectionNameForEnvironment(*environment);
@@ -63,14 +62,16 @@ std::shared_ptr<const StorebagSection> StorebagSections::fetchStorebagForEnviron
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
-    return nullptr;
+    return answer;
   }
-  version = storebag.version;
+  answer.kind = Kind::fetched;
+  answer.section = parseSection(*section);
+  answer.version = storebag.version;
   if (storebag.refreshCycle) {
-    maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
-    logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", maxAge);
+    answer.maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
+    logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
   }
-  return parseSection(*section);
+  return answer;
 }
 
 }  // namespace veltrad::config

@@ -12,9 +12,8 @@ class StorebagSections final : public StorebagSource {
  public:
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  std::shared_ptr<const StorebagSection> fetchStorebagForEnvironmentAndClientType(
-      std::int32_t clientType, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-      std::optional<std::string>* lastModified, bool& attempted) override;
+  StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
+      std::int32_t clientType, const std::optional<std::string>& lastModified) override;
 
  private:
   ProcessSettings& _settings;

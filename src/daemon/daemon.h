@@ -28,7 +28,7 @@ class Daemon {
   support::Veltra _library;
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
-  support::MessageLogFile _messageLog;
+  support::MessageLog _messageLog;
   session::FlushCounters _flushes;
   backends::BackendFactory _factory;
   config::StorebagSections _storebags;

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string_view>
 
+#include "base/version.h"
 #include "daemon/daemon.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
@@ -46,8 +47,9 @@ bool makeDirectories(const platform::Root& root) {
   const std::string messageLog = root.messageLogDirectory();
   for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory(), root.logsDirectory(),
                                        messageLog.substr(0, messageLog.rfind('/'))}) {
-    if (const auto failure = platform::makeDirectories(directory)) {
-      logError("main: cannot make a directory that the daemon writes to: %s", failure->description.c_str());
+    if (const auto made = platform::makeDirectories(directory); !made) {
+      logError("main: cannot make a directory that the daemon writes to: %s",
+               made.error().description.c_str());
       return false;
     }
   }
@@ -133,7 +135,7 @@ std::optional<int> answerArguments(int count, char** arguments) {
   if (count <= 1) return std::nullopt;
   const std::string_view argument = arguments[1];
   if (count == 2 && argument == "--version") {
-    fmt::print("veltrad {}\n", VELTRAD_VERSION);
+    fmt::print("veltrad {}\n", kVersion);
     return 0;
   }
   if (count == 2 && argument == "--help") {

@@ -19,19 +19,9 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
   return age < kSecondsBetweenAttempts ? CacheVerdict::wait : CacheVerdict::fetch;
 }
 
-// What one exchange brings.
-struct StorebagCache::Download {
-  std::optional<std::string> lastModified = std::nullopt;
-  std::int32_t maxAge = 0;
-  std::optional<std::string> version = std::nullopt;
-  bool notModified = false;
-  bool attempted = true;
-  std::shared_ptr<const config::StorebagSection> section = nullptr;
-};
-
 std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
-  Download download;
+  std::optional<std::string> lastModified;
   if (name) {
     const Lock held(_lock);
     StorebagRecord& record = settledRecord(name);
@@ -47,14 +37,13 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
           clientType, kSecondsBetweenAttempts);
       return record.data;
     }
-    download.lastModified = record.lastModified;
+    lastModified = record.lastModified;
     record.beingFetched = true;
   }
   logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
+  config::StorebagSectionAnswer answer;
   try {
-    download.section = _source.fetchStorebagForEnvironmentAndClientType(
-        clientType, download.maxAge, download.version, download.notModified, &download.lastModified,
-        download.attempted);
+    answer = _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
   } catch (const std::bad_alloc&) {
     const Lock held(_lock);
     if (name) settle(_cachedStorebags[name]);
@@ -62,7 +51,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
   }
   if (!name) return nullptr;
   const Lock held(_lock);
-  return taken(clientType, _cachedStorebags[name], std::move(download));
+  return taken(clientType, _cachedStorebags[name], std::move(answer));
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) {
@@ -85,25 +74,26 @@ StorebagRecord& StorebagCache::settledRecord(const std::string& name) {
 
 std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t clientType,
                                                                     StorebagRecord& record,
-                                                                    Download download) {
+                                                                    config::StorebagSectionAnswer answer) {
+  using Kind = config::StorebagAnswer::Kind;
   settle(record);
-  if (!download.attempted) {
+  if (!answer.attempted) {
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    return record.data ? record.data : download.section;
+    return record.data || answer.kind != Kind::fetched ? record.data : answer.section;
   }
-  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", download.maxAge);
-  record.fetchSuccessful = download.section != nullptr || download.notModified;
-  if (download.section) {
-    record.data = std::move(download.section);
-    record.version = std::move(download.version);
-  } else if (!download.notModified) {
+  logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
+  record.fetchSuccessful = answer.kind != Kind::failed;
+  if (answer.kind == Kind::fetched) {
+    record.data = std::move(answer.section);
+    record.version = std::move(answer.version);
+  } else if (answer.kind == Kind::failed) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
   }
   record.fetchTime = platform::timevalToSeconds(_clock.now());
-  record.maxAge = download.maxAge;
-  if (download.lastModified) record.lastModified = std::move(download.lastModified);
+  record.maxAge = answer.maxAge;
+  if (answer.lastModified) record.lastModified = std::move(answer.lastModified);
   record.attempted = true;
   return record.data;
 }

@@ -12,6 +12,7 @@
 namespace veltrad::config {
 class StorebagSource;
 struct StorebagSection;
+struct StorebagSectionAnswer;
 }  // namespace veltrad::config
 
 namespace veltrad::platform {
@@ -52,15 +53,13 @@ class StorebagCache {
   std::optional<std::string> versionForClientType(std::int32_t clientType);
 
  private:
-  struct Download;
-
   // Nobody fetches it any more.
   void settle(StorebagRecord& record) REQUIRES(_lock);
   // The record of this name, once nobody fetches it.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
   // What the session gets.
   std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,
-                                                       Download download) REQUIRES(_lock);
+                                                       config::StorebagSectionAnswer answer) REQUIRES(_lock);
 
   config::StorebagSource& _source;
   const platform::Clock& _clock;

@@ -13,6 +13,7 @@
 #include <utility>
 
 #include "base/text.h"
+#include "platform/shortage.h"
 
 namespace veltrad::http {
 
@@ -61,9 +62,9 @@ std::string hostOf(std::string_view url) {
   return std::string(url.substr(0, url.find_first_of("/?#")));
 }
 
-CURLcode setStore(CURL*, void* context, void* trust) {
+CURLcode setStore(CURL*, void* context, void* connections) {
   try {
-    X509_STORE* store = static_cast<TrustStore*>(trust)->current();
+    X509_STORE* store = static_cast<Connections*>(connections)->trusted();
     if (store == nullptr) return CURLE_OUT_OF_MEMORY;
     SSL_CTX_set1_cert_store(static_cast<SSL_CTX*>(context), store);
     return CURLE_OK;
@@ -72,17 +73,13 @@ CURLcode setStore(CURL*, void* context, void* trust) {
   }
 }
 
-bool isShortage(int error) {
-  return error == EMFILE || error == ENFILE || error == ENOMEM || error == ENOBUFS;
-}
-
 // Whether there are as many descriptors as libc and OpenSSL open while they resolve a name or look for a
 // certificate: neither says that it was this which it lacked.
 bool descriptorsAreShort() {
   std::array<FileDescriptor, 4> some;
   return std::any_of(some.begin(), some.end(), [](FileDescriptor& one) {
     one.reset(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    return !one.isOpen() && isShortage(errno);
+    return !one.isOpen() && platform::isShortage(errno);
   });
 }
 
@@ -115,8 +112,9 @@ CurlTransfer::CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool 
   if (!waitsForItsLane && _request.leastBytesPerSecond == 0) _deadline = now + _request.timeout;
 }
 
-bool CurlTransfer::attach(CURL* easy, TrustStore& trust, KeptConnections& connections, Time now) {
+bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   Options options(easy);
+  _easy = easy;
   _connections = &connections;
   options.set(CURLOPT_URL, _request.url.c_str());
   options.set(CURLOPT_PROTOCOLS_STR, "https");
@@ -128,7 +126,7 @@ bool CurlTransfer::attach(CURL* easy, TrustStore& trust, KeptConnections& connec
   options.set(CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
   options.set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
   options.set(CURLOPT_OPENSOCKETDATA, this);
-  options.set(CURLOPT_CLOSESOCKETFUNCTION, KeptConnections::close);
+  options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
   options.set(CURLOPT_CLOSESOCKETDATA, _connections);
   options.set(CURLOPT_FRESH_CONNECT, metEndedConnection() ? 1L : 0L);
   _connection = Connection::kept;
@@ -152,11 +150,11 @@ bool CurlTransfer::attach(CURL* easy, TrustStore& trust, KeptConnections& connec
   options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
   options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
   options.set(CURLOPT_SSL_CTX_FUNCTION, setStore);
-  options.set(CURLOPT_SSL_CTX_DATA, &trust);
-  return options.taken() && setHeaders(easy);
+  options.set(CURLOPT_SSL_CTX_DATA, _connections);
+  return options.taken() && setHeaders();
 }
 
-bool CurlTransfer::setHeaders(CURL* easy) {
+bool CurlTransfer::setHeaders() {
   _headerList.reset();
   // What libcurl would add by itself, unless the request has its own.
   std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
@@ -183,7 +181,7 @@ bool CurlTransfer::setHeaders(CURL* easy) {
   for (const auto& [automatic, found] : own) {
     if (!found && !append(std::string(automatic) + ":")) return false;
   }
-  return append("Expect:") && curl_easy_setopt(easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
+  return append("Expect:") && curl_easy_setopt(_easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
 }
 
 void CurlTransfer::setBody(Options& options) {
@@ -217,7 +215,7 @@ curl_socket_t CurlTransfer::openSocket(void* self, curlsocktype, curl_sockaddr* 
   auto& transfer = *static_cast<CurlTransfer*>(self);
   transfer._connection = Connection::own;
   const curl_socket_t made = transfer._connections->open(*address);
-  transfer._socketError = made == CURL_SOCKET_BAD && isShortage(errno) ? errno : 0;
+  transfer._socketError = made == CURL_SOCKET_BAD && platform::isShortage(errno) ? errno : 0;
   return made;
 }
 
@@ -247,19 +245,23 @@ void CurlTransfer::setLimits(Options& options, Time now) {
   options.set(CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would be no limit at all
 }
 
+// False: memory is short. An answer that nobody keeps is thrown away.
+template <typename Piece>
+bool CurlTransfer::collects(const Piece& piece) {
+  try {
+    if (_request.keepsAnswer) piece();
+  } catch (const std::bad_alloc&) {
+    _memoryShort = true;
+  }
+  return !_memoryShort;
+}
+
 std::size_t CurlTransfer::takeBody(char* bytes, std::size_t size, std::size_t count, void* self) {
   auto& transfer = *static_cast<CurlTransfer*>(self);
   const std::size_t length = size * count;
   transfer._received += length;  // far below overflow: libcurl hands over some hundred KiB at most
   if (transfer.answerTooLarge()) return CURL_WRITEFUNC_ERROR;
-  if (!transfer._request.keepsAnswer) return length;
-  try {
-    transfer._body.append(bytes, length);
-    return length;
-  } catch (const std::bad_alloc&) {
-    transfer._memoryShort = true;
-    return CURL_WRITEFUNC_ERROR;
-  }
+  return transfer.collects([&] { transfer._body.append(bytes, length); }) ? length : CURL_WRITEFUNC_ERROR;
 }
 
 // Line by line, those of interim answers and trailers too.
@@ -269,14 +271,7 @@ std::size_t CurlTransfer::takeHeader(char* bytes, std::size_t size, std::size_t 
   transfer._headerBytes += length;
   if (transfer._headerBytes > kMostHeaderBytes || ++transfer._headerLines > kMostHeaderLines)
     return CURL_WRITEFUNC_ERROR;
-  if (!transfer._request.keepsAnswer) return length;
-  try {
-    transfer.collectHeader({bytes, length});
-    return length;
-  } catch (const std::bad_alloc&) {
-    transfer._memoryShort = true;
-    return CURL_WRITEFUNC_ERROR;
-  }
+  return transfer.collects([&] { transfer.collectHeader({bytes, length}); }) ? length : CURL_WRITEFUNC_ERROR;
 }
 
 void CurlTransfer::collectHeader(std::string_view line) {
@@ -294,9 +289,9 @@ void CurlTransfer::collectHeader(std::string_view line) {
   }
 }
 
-HTTPResult CurlTransfer::result(CURLcode code, CURL* easy) {
+HTTPResult CurlTransfer::result(CURLcode code) {
   long status = 0;
-  curl_easy_getinfo(easy, CURLINFO_RESPONSE_CODE, &status);
+  curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
   const bool statusCounts = code == CURLE_OK || (answerTooLarge() && !_request.keepsAnswer);
   if (statusCounts) return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body)};
   HTTPError error{kindOf(code), {}, static_cast<int>(status)};

@@ -11,14 +11,13 @@
 #include <string>
 #include <string_view>
 
+#include "http/connections.h"
 #include "http/http_client.h"
-#include "http/kept_connections.h"
-#include "http/trust_store.h"
 
 namespace veltrad::http {
 
-// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `trust` and
-// `connections` must live.
+// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `connections`
+// must live. Its 24 fields are the request, what libcurl is given, and the answer as it comes.
 class CurlTransfer {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -37,12 +36,13 @@ class CurlTransfer {
   bool expired(Time now) const { return _deadline && *_deadline <= now; }
 
   // Sets `easy` up, which is fresh or reset. False, or std::bad_alloc: there is no memory for it.
-  bool attach(CURL* easy, TrustStore& trust, KeptConnections& connections, Time now);
+  bool attach(CURL* easy, Connections& connections, Time now);
+  CURL* easy() const { return _easy; }  // the one attached last
   // The kept connection that libcurl chose had ended, so nothing was sent: attach again, once; it then gets a
   // new one.
   bool metEndedConnection() const { return _connection == Connection::ended; }
   // What libcurl's verdict means; reads the attached handle.
-  HTTPResult result(CURLcode code, CURL* easy);
+  HTTPResult result(CURLcode code);
   HTTPResult timedOutWaiting() const;
   static HTTPError stopping() { return {HTTPError::Kind::stopping, "The daemon is stopping"}; }
   static HTTPError outOfMemory() {
@@ -59,9 +59,11 @@ class CurlTransfer {
 
   class Options;
 
-  bool setHeaders(CURL* easy);
+  bool setHeaders();
   void setBody(Options& options);
   void setLimits(Options& options, Time now);
+  template <typename Piece>
+  bool collects(const Piece& piece);
   void collectHeader(std::string_view line);
   bool answerTooLarge() const { return _received > _request.mostResponseBytes; }
   HTTPError::Kind kindOf(CURLcode code) const;
@@ -81,7 +83,8 @@ class CurlTransfer {
   const Time _arrived;
   std::optional<Time> _deadline;  // of uploads and log data once they run; none: a least speed holds instead
 
-  KeptConnections* _connections = nullptr;
+  CURL* _easy = nullptr;
+  Connections* _connections = nullptr;
   Connection _connection = Connection::kept;
   HeaderList _headerList{nullptr, curl_slist_free_all};
   std::array<char, CURL_ERROR_SIZE> _error{};

@@ -1,7 +1,12 @@
-// HTTPS requests: the callers' side. Any thread.
+// HTTPS requests: from any thread to the HTTP thread, and that thread's loop.
 #include "http/http_client.h"
 
+#include <curl/curl.h>
+#include <pthread.h>
+
+#include <algorithm>
 #include <atomic>
+#include <future>
 #include <new>
 #include <system_error>
 #include <thread>
@@ -9,34 +14,12 @@
 #include "base/mutex.h"
 #include "base/text.h"
 #include "base/value.h"
-#include "http/http_inbox.h"
-#include "http/http_worker.h"
+#include "http/connections.h"
+#include "http/curl_transfer.h"
+#include "http/http_queue.h"
+#include "platform/log.h"
 
 namespace veltrad::http {
-
-namespace {
-
-// One perform(): its thread waits here for the HTTP thread.
-class Answer {
- public:
-  void give(HTTPResult result) {
-    const Lock lock(_mutex);
-    _result.emplace(std::move(result));
-    _given.notifyOne();
-  }
-  HTTPResult wait() {
-    const Lock lock(_mutex);
-    while (!_result) _given.wait(_mutex);
-    return std::move(*_result);
-  }
-
- private:
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  Condition _given;
-  std::optional<HTTPResult> _result GUARDED_BY(_mutex);
-};
-
-}  // namespace
 
 std::optional<std::string_view> HTTPResponse::header(std::string_view name) const {
   for (const auto& [key, value] : headers) {
@@ -55,103 +38,261 @@ std::size_t keptBytes(const HTTPRequest& request) {
   return bytes;
 }
 
+// The client's insides: what any thread calls, and the thread that runs libcurl's multi interface and every
+// completion. Memory that is short ends the transfer that needs it, not the thread.
 struct CurlHTTPClient::Impl {
-  explicit Impl(HTTPClientSettings given) : settings(std::move(given)) {}
+  using Transfers = HTTPQueue::Transfers;
+  using Multi = std::unique_ptr<CURLM, decltype(&curl_multi_cleanup)>;
+  using Easy = std::unique_ptr<CURL, decltype(&curl_easy_cleanup)>;
+  static constexpr std::size_t kIdleHandles = 8;
 
-  // Nothing: it was taken.
-  std::optional<HTTPError> file(HTTPRequest request, HTTPCompletion completion, bool blocking) {
-    try {
-      if (auto error = startThread()) return error;
-      HTTPInbox::Transfers one;
-      one.push_back(std::make_unique<CurlTransfer>(std::move(request), std::move(completion), blocking,
-                                                   std::chrono::steady_clock::now()));
-      const HTTPInbox::Added added = inbox.add(one);
-      if (added == HTTPInbox::Added::refused)
-        return HTTPError{HTTPError::Kind::tooMany, "Too many posts under way"};
-      if (added == HTTPInbox::Added::first) worker->wake();
-      return std::nullopt;
-    } catch (const std::bad_alloc&) {
-      return CurlTransfer::outOfMemory();
-    }
+  explicit Impl(HTTPClientSettings settings) : connections(std::move(settings.extraCertificatesPath)) {
+    idleHandles.reserve(kIdleHandles);
   }
-  // Nothing of libcurl is touched before the first request. What was short is not remembered.
-  std::optional<HTTPError> startThread() {
-    if (started.load(std::memory_order_acquire)) return std::nullopt;
-    const Lock lock(starting);
-    if (started.load(std::memory_order_relaxed)) return std::nullopt;
-    auto made = HTTPWorker::make(inbox, settings.extraCertificatesPath);
-    if (!made) return HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"};
-    try {
-      thread = std::thread([running = made.get()] { running->run(); });
-    } catch (const std::system_error& error) {
-      return HTTPError{HTTPError::Kind::shortage,
-                       std::string("The HTTP thread cannot be started: ") + error.code().message().c_str()};
-    }
-    worker = std::move(made);
-    started.store(true, std::memory_order_release);
-    return std::nullopt;
-  }
+
+  // Any thread
+
+  Result<Done, HTTPError> file(HTTPRequest request, HTTPCompletion completion, bool blocking);
+  Result<Done, HTTPError> startThread();
   // False when there is no thread yet.
-  bool wake() {
-    const bool there = started.load(std::memory_order_acquire);
-    if (there) worker->wake();
-    return there;
-  }
+  bool wake();
 
-  const HTTPClientSettings settings;
-  HTTPInbox inbox;
+  // HTTP thread
+
+  void run();
+  void stop(const HTTPQueue::Predicate& matches);
+  void startNext();
+  void startOne(Transfers one);
+  bool begins(CURL* easy, CurlTransfer& transfer);
+  Transfers takeRunning(Transfers::iterator at);
+  void finish();
+  void endExpired();
+  void end(Transfers one, HTTPResult result);
+  void complete(Transfers one, HTTPResult result);
+  void keep(Easy easy);
+
+  HTTPQueue queue;
   Mutex starting LEAF_LOCK{LockRank::leaf};
-  std::atomic<bool> started{false};
-  std::unique_ptr<HTTPWorker> worker;  // both set once, before `started`
+  std::atomic<bool> started{false};  // after it `multi` and `thread` stay as they are
+  Connections connections;           // outlives the two that use it
+  Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
+
+  // HTTP thread only
+  std::vector<Easy> idleHandles;  // their set-up costs more than a reset
+  Transfers running;
 };
+
+Result<Done, HTTPError> CurlHTTPClient::Impl::file(HTTPRequest request, HTTPCompletion completion,
+                                                   bool blocking) {
+  try {
+    if (auto running = startThread(); !running) return running;
+    Transfers one;
+    one.emplace_back(std::move(request), std::move(completion), blocking, std::chrono::steady_clock::now());
+    const HTTPQueue::Added added = queue.add(one);
+    if (added == HTTPQueue::Added::full)
+      return Failure{HTTPError{HTTPError::Kind::tooMany, "Too many posts under way"}};
+    if (added == HTTPQueue::Added::first) wake();
+    return Done();
+  } catch (const std::bad_alloc&) {
+    return Failure{CurlTransfer::outOfMemory()};
+  }
+}
+
+// Nothing of libcurl is touched before the first request. What was short is not remembered.
+Result<Done, HTTPError> CurlHTTPClient::Impl::startThread() {
+  if (started.load(std::memory_order_acquire)) return Done();
+  const Lock lock(starting);
+  if (started.load(std::memory_order_relaxed)) return Done();
+  const bool initialised = curl_global_init(CURL_GLOBAL_DEFAULT) == CURLE_OK;
+  multi.reset(initialised ? curl_multi_init() : nullptr);
+  // Without descriptors it is made all the same, but nobody could wake it.
+  if (!multi || curl_multi_wakeup(multi.get()) != CURLM_OK)
+    return Failure{HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"}};
+  curl_multi_setopt(multi.get(), CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
+  curl_multi_setopt(multi.get(), CURLMOPT_MAX_HOST_CONNECTIONS, static_cast<long>(HTTPQueue::kConnections));
+  curl_multi_setopt(multi.get(), CURLMOPT_MAXCONNECTS, 8L);  // kept alive
+  try {
+    thread = std::thread([this] { run(); });
+  } catch (const std::system_error& error) {
+    return Failure{HTTPError{HTTPError::Kind::shortage, std::string("The HTTP thread cannot be started: ") +
+                                                            error.code().message().c_str()}};
+  }
+  started.store(true, std::memory_order_release);
+  return Done();
+}
+
+bool CurlHTTPClient::Impl::wake() {
+  const bool there = started.load(std::memory_order_acquire);
+  if (there) curl_multi_wakeup(multi.get());
+  return there;
+}
+
+void CurlHTTPClient::Impl::run() {
+  pthread_setname_np(pthread_self(), "http");
+  for (;;) {
+    const HTTPQueue::Orders orders = queue.look();
+    if (orders.last && running.empty() && queue.empty()) return;
+    if (orders.stopping)
+      stop([](const CurlTransfer&) { return true; });
+    else if (orders.failBlocking)
+      stop([](const CurlTransfer& transfer) { return transfer.blocking(); });
+    int left = 0;
+    curl_multi_perform(multi.get(), &left);
+    finish();
+    endExpired();
+    startNext();
+    if (orders.last) continue;  // until nothing is left, completions' own requests included
+    constexpr int kCheckWaiting = 50, kIdle = 3'600'000;  // ms; libcurl's own timers come first
+    curl_multi_poll(multi.get(), nullptr, 0, queue.empty() ? kIdle : kCheckWaiting, nullptr);
+  }
+}
+
+void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
+  for (Transfers taken = queue.take(matches); !taken.empty();)
+    complete(HTTPQueue::pop(taken, taken.begin()), Failure{CurlTransfer::stopping()});
+  for (auto next = running.begin(); next != running.end();) {
+    const auto at = next++;
+    if (matches(*at)) end(takeRunning(at), Failure{CurlTransfer::stopping()});
+  }
+}
+
+void CurlHTTPClient::Impl::startNext() {
+  try {
+    const auto now = std::chrono::steady_clock::now();
+    for (Transfers one = queue.next(now); !one.empty(); one = queue.next(now)) startOne(std::move(one));
+  } catch (const std::bad_alloc&) {
+    // They go on waiting, at most until their time is over.
+  }
+}
+
+void CurlHTTPClient::Impl::startOne(Transfers one) {
+  Easy easy(nullptr, curl_easy_cleanup);
+  if (idleHandles.empty()) {
+    easy.reset(curl_easy_init());
+  } else {
+    easy = std::move(idleHandles.back());
+    idleHandles.pop_back();
+  }
+  if (easy && begins(easy.get(), one.front())) {
+    static_cast<void>(easy.release());  // the running transfer has it
+    return running.splice(running.end(), one);
+  }
+  if (easy) keep(std::move(easy));
+  end(std::move(one), Failure{CurlTransfer::outOfMemory()});
+}
+
+// False: there is no memory for it, and nothing has changed.
+bool CurlHTTPClient::Impl::begins(CURL* easy, CurlTransfer& transfer) {
+  try {
+    return transfer.attach(easy, connections, std::chrono::steady_clock::now()) &&
+           curl_multi_add_handle(multi.get(), easy) == CURLM_OK;
+  } catch (const std::bad_alloc&) {
+    return false;
+  }
+}
+
+void CurlHTTPClient::Impl::finish() {
+  int left = 0;
+  while (const CURLMsg* message = curl_multi_info_read(multi.get(), &left)) {
+    if (message->msg != CURLMSG_DONE) continue;
+    const CURLcode code = message->data.result;
+    const auto found = std::find_if(running.begin(), running.end(), [message](const CurlTransfer& transfer) {
+      return transfer.easy() == message->easy_handle;
+    });
+    HTTPResult result = found->result(code);
+    Transfers one = takeRunning(found);
+    if (code == CURLE_ABORTED_BY_CALLBACK && one.front().metEndedConnection())
+      startOne(std::move(one));
+    else
+      end(std::move(one), std::move(result));
+  }
+}
+
+// Those that run are timed by libcurl.
+void CurlHTTPClient::Impl::endExpired() {
+  const auto now = std::chrono::steady_clock::now();
+  Transfers taken = queue.take([now](const CurlTransfer& transfer) { return transfer.expired(now); });
+  while (!taken.empty()) {
+    Transfers one = HTTPQueue::pop(taken, taken.begin());
+    HTTPResult timedOut = one.front().timedOutWaiting();
+    complete(std::move(one), std::move(timedOut));
+  }
+}
+
+CurlHTTPClient::Impl::Transfers CurlHTTPClient::Impl::takeRunning(Transfers::iterator at) {
+  curl_multi_remove_handle(multi.get(), at->easy());
+  keep(Easy(at->easy(), curl_easy_cleanup));
+  return HTTPQueue::pop(running, at);
+}
+
+void CurlHTTPClient::Impl::end(Transfers one, HTTPResult result) {
+  queue.ended(one.front());
+  complete(std::move(one), std::move(result));
+}
+
+void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
+  try {
+    one.front().complete(std::move(result));
+  } catch (const std::bad_alloc&) {
+    logError("An answer could not be handled: out of memory");
+  }
+  one.clear();
+  queue.completed();
+}
+
+void CurlHTTPClient::Impl::keep(Easy easy) {
+  curl_easy_reset(easy.get());
+  if (idleHandles.size() < kIdleHandles) idleHandles.push_back(std::move(easy));
+}
 
 CurlHTTPClient::CurlHTTPClient(HTTPClientSettings settings)
     : _impl(std::make_unique<Impl>(std::move(settings))) {}
 
 CurlHTTPClient::~CurlHTTPClient() {
-  _impl->inbox.stop(true);
+  _impl->queue.stop(true);
   if (_impl->wake()) _impl->thread.join();
 }
 
-std::optional<HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
+Result<Done, HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletion completion) {
   return _impl->file(std::move(request), std::move(completion), false);
 }
 
 HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
-  if (_impl->inbox.blockingFails()) return Failure{CurlTransfer::stopping()};
-  const auto answer =
-      std::make_shared<Answer>();  // the giver may still be at its lock when the waiter has gone
-  auto refusal = _impl->file(
-      std::move(request), [answer](HTTPResult result) { answer->give(std::move(result)); }, true);
-  if (refusal) return Failure{std::move(*refusal)};
-  return answer->wait();
+  if (stopping()) return Failure{CurlTransfer::stopping()};
+  // The giver may not be done with it when the waiter has gone.
+  const auto answer = std::make_shared<std::promise<HTTPResult>>();
+  std::future<HTTPResult> given = answer->get_future();
+  const auto taken = _impl->file(
+      std::move(request), [answer](HTTPResult result) { answer->set_value(std::move(result)); }, true);
+  if (!taken) return Failure{taken.error()};
+  return given.get();
 }
 
 bool CurlHTTPClient::stopping() const {
-  return _impl->inbox.blockingFails();
+  return _impl->queue.blockingFails();
 }
 
 void CurlHTTPClient::failBlockingWaits() {
-  _impl->inbox.failBlocking();
+  _impl->queue.failBlocking();
   _impl->wake();
 }
 
 void CurlHTTPClient::drain(std::chrono::steady_clock::time_point deadline) {
-  if (_impl->inbox.waitUntilIdle(deadline)) return;
-  _impl->inbox.stop(false);
+  if (_impl->queue.waitUntilIdle(deadline)) return;
+  _impl->queue.stop(false);
   _impl->wake();
-  _impl->inbox.waitUntilIdle(std::chrono::steady_clock::time_point::max());
+  _impl->queue.waitUntilIdle(std::chrono::steady_clock::time_point::max());
 }
 
 bool CurlHTTPClient::passesEmptyTask(std::chrono::milliseconds within) {
   const auto deadline = std::chrono::steady_clock::now() + within;
-  const std::uint64_t task = _impl->inbox.addEmptyTask();
-  return !_impl->wake() || _impl->inbox.waitForEmptyTask(task, deadline);
+  const std::future<void> passed = _impl->queue.addEmptyTask();
+  return !_impl->wake() || passed.wait_until(deadline) == std::future_status::ready;
 }
 
 std::size_t CurlHTTPClient::underWay() const {
-  return _impl->inbox.events();
+  return _impl->queue.events();
 }
 
 }  // namespace veltrad::http

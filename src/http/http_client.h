@@ -86,9 +86,9 @@ using HTTPCompletion = std::function<void(HTTPResult)>;
 class HTTPClient {
  public:
   virtual ~HTTPClient() = default;
-  // Nothing: `completion` will run exactly once, never inside this call. Else it was not taken (tooMany,
-  // shortage) and the completion never runs.
-  [[nodiscard]] virtual std::optional<HTTPError> start(HTTPRequest request, HTTPCompletion completion) = 0;
+  // Done: `completion` will run exactly once, never inside this call. Else the request was not taken
+  // (tooMany, shortage) and the completion never runs.
+  virtual Result<Done, HTTPError> start(HTTPRequest request, HTTPCompletion completion) = 0;
   // Waits for the answer on the caller's thread; fails at once with `stopping` after failBlockingWaits().
   virtual HTTPResult perform(HTTPRequest request) = 0;
   // perform() fails at once: work that leads to one can be given up.
@@ -105,7 +105,7 @@ class CurlHTTPClient final : public HTTPClient {
  public:
   explicit CurlHTTPClient(HTTPClientSettings settings);
   ~CurlHTTPClient() override;  // ends every transfer with `stopping`, then joins
-  std::optional<HTTPError> start(HTTPRequest request, HTTPCompletion completion) override;
+  Result<Done, HTTPError> start(HTTPRequest request, HTTPCompletion completion) override;
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 

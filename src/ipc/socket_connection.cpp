@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <new>
 
+#include "base/version.h"
 #include "ipc/client_events.h"
 #include "ipc/dispatcher.h"
 #include "platform/log.h"
@@ -25,7 +26,6 @@ using Clock = std::chrono::steady_clock;
 constexpr std::chrono::seconds kLastWrites{1};
 // Unfinished frames of the same user hold all that they may: most of them end soon, some never.
 constexpr std::chrono::seconds kLongestWaitForFrames{2};
-constexpr const char* kDaemonVersion = "8.0";
 
 }  // namespace
 
@@ -223,7 +223,7 @@ bool SocketConnection::greet(const wire::Frame& frame) {
   }
   _greeted = true;
   _out->sendReply(wire::makeFrame(wire::FrameKind::hello, 0,
-                                  {{key::kWire, wire::kWireVersion}, {key::kDaemon, kDaemonVersion}}));
+                                  {{key::kWire, wire::kWireVersion}, {key::kDaemon, kVersion}}));
   return true;
 }
 

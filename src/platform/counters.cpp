@@ -27,10 +27,11 @@ void Counters::writeIfChanged(FileStore& files, const std::string& path, double 
   const Dictionary all{{"pid", static_cast<int>(::getpid())},
                        {"started", startedAt},
                        {"counts", Dictionary::fromEntries(std::move(counts))}};
-  const auto failure = files.replace(path, formats::writeJSON(all) + "\n", 0644);
-  if (failure && !_failed) logError("The counters could not be written: %s", failure->description.c_str());
-  _failed = failure.has_value();
-  if (!failure) _sumWritten.store(sum, std::memory_order_relaxed);
+  const auto written = files.replace(path, formats::writeJSON(all) + "\n", 0644);
+  if (!written && !_failed)
+    logError("The counters could not be written: %s", written.error().description.c_str());
+  _failed = !written;
+  if (written) _sumWritten.store(sum, std::memory_order_relaxed);
 }
 
 }  // namespace veltrad::platform

@@ -119,23 +119,23 @@ Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, st
   return bytes;
 }
 
-std::optional<FileFailure> DiskFileStore::replace(const std::string& path, std::string_view bytes,
-                                                  unsigned mode) {
+Result<Done, FileFailure> DiskFileStore::replace(const std::string& path, std::string_view bytes,
+                                                 unsigned mode) {
   const std::string fresh = path + "." + randomUUIDText().substr(0, 8) + ".new";
-  if (const int error = writeNewFile(fresh, bytes, mode)) return failureOf(path, error);
+  if (const int error = writeNewFile(fresh, bytes, mode)) return Failure{failureOf(path, error)};
   if (::rename(fresh.c_str(), path.c_str()) != 0) {
     const int error = errno;
     ::unlink(fresh.c_str());
-    return failureOf(path, error);
+    return Failure{failureOf(path, error)};
   }
-  if (const int error = syncDirectory(directoryOf(path))) return failureOf(directoryOf(path), error);
-  return std::nullopt;
+  if (const int error = syncDirectory(directoryOf(path))) return Failure{failureOf(directoryOf(path), error)};
+  return Done();
 }
 
-std::optional<FileFailure> DiskFileStore::rename(const std::string& from, const std::string& to) {
-  if (::rename(from.c_str(), to.c_str()) != 0) return failureOf(from, errno);
-  if (const int error = syncDirectory(directoryOf(to))) return failureOf(directoryOf(to), error);
-  return std::nullopt;
+Result<Done, FileFailure> DiskFileStore::rename(const std::string& from, const std::string& to) {
+  if (::rename(from.c_str(), to.c_str()) != 0) return Failure{failureOf(from, errno)};
+  if (const int error = syncDirectory(directoryOf(to))) return Failure{failureOf(directoryOf(to), error)};
+  return Done();
 }
 
 Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
@@ -155,21 +155,21 @@ Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   return FileStamp(hash);
 }
 
-std::optional<FileFailure> makeDirectories(const std::string& path) {
+Result<Done, FileFailure> makeDirectories(const std::string& path) {
   for (std::size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
     if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) {
       const int error = errno;
       // A parent on a read-only or closed file system that is there already is none of our concern.
       struct stat status {};
-      if (::stat(part.c_str(), &status) != 0) return failureOf(part, error);
+      if (::stat(part.c_str(), &status) != 0) return Failure{failureOf(part, error)};
     }
     if (end == std::string::npos) break;
   }
   struct stat status {};
-  if (::stat(path.c_str(), &status) != 0) return failureOf(path, errno);
-  if (!S_ISDIR(status.st_mode)) return failureOf(path, ENOTDIR);
-  return std::nullopt;
+  if (::stat(path.c_str(), &status) != 0) return Failure{failureOf(path, errno)};
+  if (!S_ISDIR(status.st_mode)) return Failure{failureOf(path, ENOTDIR)};
+  return Done();
 }
 
 std::size_t removeUnfinishedFiles(const std::string& directory) {

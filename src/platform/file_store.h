@@ -27,11 +27,11 @@ class FileStore {
   // A regular file of at most `most` bytes, whole.
   virtual Result<std::string, FileFailure> read(const std::string& path, std::size_t most = 16u << 20) = 0;
   // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW, mode 0600 unless `mode` says else), syncs,
-  // renames, syncs the directory. On failure the old file is untouched and the new one gone. Nothing: done.
-  virtual std::optional<FileFailure> replace(const std::string& path, std::string_view bytes,
-                                             unsigned mode = 0600) = 0;
+  // renames, syncs the directory. On failure the old file is untouched and the new one gone.
+  virtual Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes,
+                                            unsigned mode = 0600) = 0;
   // Renames within one directory.
-  virtual std::optional<FileFailure> rename(const std::string& from, const std::string& to) = 0;
+  virtual Result<Done, FileFailure> rename(const std::string& from, const std::string& to) = 0;
   // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
   // alone.
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
@@ -40,13 +40,13 @@ class FileStore {
 class DiskFileStore final : public FileStore {
  public:
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
-  std::optional<FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
-  std::optional<FileFailure> rename(const std::string& from, const std::string& to) override;
+  Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
+  Result<Done, FileFailure> rename(const std::string& from, const std::string& to) override;
   Result<FileStamp, FileFailure> stamp(const std::string& path) override;
 };
 
 // Makes the directory and its parents (mode 0755) where they are missing.
-std::optional<FileFailure> makeDirectories(const std::string& path);
+Result<Done, FileFailure> makeDirectories(const std::string& path);
 
 // Removes what a replace() that was killed has left in the directory: regular files under its pattern of
 // names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.

@@ -4,7 +4,6 @@
 #include <openssl/evp.h>
 
 #include <charconv>
-#include <cstdio>
 
 #include "base/text.h"
 #include "platform/environment_file.h"
@@ -121,13 +120,7 @@ std::optional<std::string> MachineFacts::uniqueDeviceID() {
   unsigned char digest[EVP_MAX_MD_SIZE];
   if (EVP_Digest(salted.data(), salted.size(), digest, nullptr, EVP_sha256(), nullptr) != 1)
     return std::nullopt;
-  std::string text;
-  for (int i = 0; i < 20; ++i) {
-    char digits[3];
-    std::snprintf(digits, sizeof digits, "%02x", static_cast<unsigned>(digest[i]));
-    text += digits;
-  }
-  return text;
+  return hex({reinterpret_cast<const char*>(digest), 20});
 }
 
 // Existence is asked alone: the sandbox lets nobody open what this is asked of.

@@ -137,12 +137,13 @@ Result<Dictionary, FileFailure> FilePreferences::refused(const std::string& path
   const auto stamp = _files.stamp(path);
   if (!stamp) return Failure{stamp.error()};
   const bool said = _complained.contains(path) && _complained[path] == stamp.value();
-  const auto failure = putAside ? _files.rename(path, path + ".corrupt") : std::nullopt;
+  const auto renamed = putAside ? _files.rename(path, path + ".corrupt") : Done();
   std::string line = "Preferences could not be read, defaults serve: " + why.description;
-  if (putAside) line += failure ? "; not renamed, " + failure->description : "; kept as " + path + ".corrupt";
+  if (putAside)
+    line += renamed ? "; kept as " + path + ".corrupt" : "; not renamed, " + renamed.error().description;
   if (!said) complaints.push_back(std::move(line));
   _complained[path] = stamp.value();
-  if (!putAside || failure) return Failure{std::move(why)};
+  if (!putAside || !renamed) return Failure{std::move(why)};
   return Dictionary();
 }
 
@@ -156,9 +157,9 @@ bool FilePreferences::store(std::string_view domain, std::string_view key, const
   }
   Dictionary changed = std::move(all).value();
   changed.set(std::string(key), value);
-  const auto failure = _files.replace(path, writeBinaryPropertyList(changed));
-  if (!failure) return true;
-  complaints.push_back("Preference not stored: " + failure->description + ", " + std::string(key));
+  const auto stored = _files.replace(path, writeBinaryPropertyList(changed));
+  if (stored) return true;
+  complaints.push_back("Preference not stored: " + stored.error().description + ", " + std::string(key));
   return false;
 }
 

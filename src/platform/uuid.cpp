@@ -5,6 +5,8 @@
 
 #include <cstdlib>
 
+#include "base/text.h"
+
 namespace veltrad::platform {
 
 std::array<unsigned char, 16> randomUUID() {
@@ -18,15 +20,9 @@ std::array<unsigned char, 16> randomUUID() {
 }
 
 std::string randomUUIDText() {
-  static constexpr char kDigits[] = "0123456789ABCDEF";
   const auto bytes = randomUUID();
-  std::string text;
-  text.reserve(36);
-  for (std::size_t i = 0; i < bytes.size(); ++i) {
-    if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
-    text += kDigits[bytes[i] >> 4];
-    text += kDigits[bytes[i] & 0x0f];
-  }
+  std::string text = hex({reinterpret_cast<const char*>(bytes.data()), bytes.size()}, kUpperCaseDigits);
+  for (const std::size_t place : {8u, 13u, 18u, 23u}) text.insert(place, "-");
   return text;
 }
 

@@ -37,7 +37,7 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   for (const auto& [name, backend] : *set) {
     backend->updateState();
     const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
-    if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", {name, *answer});
+    if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();
 }

@@ -16,7 +16,7 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, const Mes
     auto answer =
         backend->sendMessage(message.payload, message.time, message.category, message.type, message.flag);
     if (!answer) continue;
-    messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", {name, *answer});
+    messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);
     const bool replaces = backend->name() == wire::kVeltraBackendHTTPPost;
     const bool standsIn = backend->name() == wire::kVeltraBackendDashboard && !result;
     if (replaces || standsIn) result = std::move(answer);
@@ -43,7 +43,7 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
         [&flushes, &messageLog, flush, key = name, own = backend->name()](
             const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
           logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
-          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", {key, *answer});
+          if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", key, *answer);
           flushes.finished(*flush, answer, error);
         });
   }
@@ -61,9 +61,8 @@ bool uploadFile(const BackendSet* backends, const std::string& path, const std::
     logError("uploadFileWithURL: File upload failed for %s", path.c_str());
   }
   // The full text of the file's address.
-  messageLog.writeToLogFile(
-      "[uploadFileWithURL] Upload %@ for file %@",
-      {uploaded ? "succeeded" : "failed", "file://" + percentEncoded(path, "/!$&'()*+,;=:@")});
+  messageLog.writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", uploaded ? "succeeded" : "failed",
+                            "file://" + percentEncoded(path, "/!$&'()*+,;=:@"));
   return uploaded;
 }
 

@@ -1,7 +1,8 @@
-// Compression with zlib's deflate, one pass over the input. Any thread.
+// Compression with zlib's deflate, one pass over the input.
 #include "support/gzip.h"
 
-#include <algorithm>
+#include <zlib.h>
+
 #include <limits>
 #include <new>
 
@@ -11,20 +12,78 @@ namespace veltrad::support {
 namespace {
 
 constexpr std::size_t kPieceBytes = 128u << 10;
+constexpr std::size_t kMostAtOnce = std::numeric_limits<int>::max();  // zlib counts its bounds in 32 bits
+constexpr const char* kZlibVersion = "1.2.8";  // the oldest whose streams are known to be read
+constexpr int kMemoryLevel = 8;
+constexpr int kGzipWindowBits = 15 + 16;  // the largest window; a gzip header and trailer
 
-// Fills `output` from its start; the number of bytes produced is stream.total_out. Z_STREAM_END: all is
-// there.
-int deflateWhole(z_stream& stream, std::string& output) {
-  constexpr std::size_t kMostSpace = std::numeric_limits<uInt>::max();
-  int result = Z_OK;
-  while (result == Z_OK) {
-    const std::size_t produced = stream.total_out;
-    stream.next_out = reinterpret_cast<Bytef*>(output.data() + produced);
-    stream.avail_out = static_cast<uInt>(std::min(output.size() - produced, kMostSpace));
-    result = deflate(&stream, Z_FINISH);
+struct FailureText {
+  int result;
+  const char* atInitialisation;
+  const char* duringCompression;
+};
+constexpr const char* kUnknown = "Unknown error code.";
+constexpr FailureText kTexts[] = {
+    {Z_VERSION_ERROR, "The version of zlib.h and the version of the library linked do not match.",
+     "The version of zlib.h and the version of the library linked do not match."},
+    {Z_BUF_ERROR, kUnknown, "Ran out of output buffer for writing compressed bytes."},
+    {Z_MEM_ERROR, "Insufficient memory.", "Memory could not be allocated for processing."},
+    {Z_DATA_ERROR, kUnknown, "The deflate data was invalid or incomplete."},
+    {Z_STREAM_ERROR, "Invalid parameter passed in to function.",
+     "The stream state was inconsistent (e.g., next_in or next_out was NULL)."},
+    {Z_ERRNO, kUnknown, "Error occured while reading file."}};
+
+const char* textOf(int result, const char* FailureText::*when) {
+  for (const FailureText& text : kTexts) {
+    if (text.result == result) return text.*when;
   }
-  return result;
+  return kUnknown;
 }
+
+const char* shown(const char* message) {
+  return message != nullptr ? message : "(null)";
+}
+
+// One stream of deflate; ends with its object.
+class Deflation {
+ public:
+  Deflation() = default;
+  ~Deflation() {
+    if (_begun) deflateEnd(&stream);
+  }
+  Deflation(const Deflation&) = delete;
+  Deflation& operator=(const Deflation&) = delete;
+
+  bool begin() {
+    const int result = deflateInit2_(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, kGzipWindowBits,
+                                     kMemoryLevel, Z_DEFAULT_STRATEGY, kZlibVersion, sizeof stream);
+    _begun = result == Z_OK;
+    if (!_begun) {
+      logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",
+               textOf(result, &FailureText::atInitialisation), shown(stream.msg));
+    }
+    return _begun;
+  }
+  void give(const char* bytes, std::size_t count) {
+    stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes));  // zlib only reads them
+    stream.avail_in = static_cast<uInt>(count);
+  }
+  // deflate()'s result, with `room` to write to.
+  int run(int flush, std::string& room) {
+    stream.next_out = reinterpret_cast<Bytef*>(room.data());
+    stream.avail_out = static_cast<uInt>(room.size());
+    return deflate(&stream, flush);
+  }
+  void sayFailure(int result) const {
+    logError("compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
+             textOf(result, &FailureText::duringCompression), shown(stream.msg));
+  }
+
+  z_stream stream{};
+
+ private:
+  bool _begun = false;
+};
 
 void sayEmpty() {
   logError("compressDataWithZlibOrGzip: Cannot compress empty Torvane");
@@ -39,16 +98,25 @@ void sayCompressed(std::size_t from, std::size_t to) {
            static_cast<unsigned>(to));
 }
 
-// False, and a line has said why.
-bool deflateAll(const ByteSource& source, const ByteSink& sink) {
+// Hands on what comes out, all of it where `flush` says so.
+bool append(Deflation& deflation, int flush, std::string& room, const ByteSink& sink) {
+  int result = Z_OK;
+  do {
+    result = deflation.run(flush, room);
+    const std::size_t made = room.size() - deflation.stream.avail_out;
+    if (made > 0 && !sink(std::string_view(room).substr(0, made))) return false;
+  } while (result == Z_OK && deflation.stream.avail_out == 0);
+  const bool nothingToDo = result == Z_BUF_ERROR && flush != Z_FINISH;
+  if (result == Z_OK || result == Z_STREAM_END || nothingToDo) return true;
+  deflation.sayFailure(result);
+  return false;
+}
+
+bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
   Deflation deflation;
-  if (!deflation.begin(Deflation::Wrapper::gzip)) return false;
-  std::string piece(kPieceBytes, '\0'), buffer(kPieceBytes, '\0');
-  std::size_t taken = 0, made = 0;
-  const ByteSink counting = [&](std::string_view bytes) {
-    made += bytes.size();
-    return sink(bytes);
-  };
+  if (!deflation.begin()) return false;
+  std::string piece(kPieceBytes, '\0'), room(kPieceBytes, '\0');
+  std::size_t taken = 0;
   std::optional<std::size_t> count;
   do {
     count = source(piece.data(), piece.size());
@@ -58,24 +126,26 @@ bool deflateAll(const ByteSource& source, const ByteSink& sink) {
       sayEmpty();
       return false;
     }
-    deflation.stream().next_in = reinterpret_cast<Bytef*>(piece.data());
-    deflation.stream().avail_in = static_cast<uInt>(*count);
-    if (!deflation.append(*count == 0 ? Z_FINISH : Z_NO_FLUSH, buffer, counting)) return false;
+    deflation.give(piece.data(), *count);
+    if (!append(deflation, *count == 0 ? Z_FINISH : Z_NO_FLUSH, room, sink)) return false;
   } while (*count > 0);
-  sayCompressed(taken, made);
+  sayCompressed(taken, deflation.stream.total_out);
   return true;
 }
 
-// Within what zlib counts.
-std::optional<std::string> deflateBytes(bool gzip, std::string_view bytes) {
+std::optional<std::string> deflateAtOnce(std::string_view bytes) {
   Deflation deflation;
-  if (!deflation.begin(gzip ? Deflation::Wrapper::gzip : Deflation::Wrapper::zlib)) return std::nullopt;
-  z_stream& stream = deflation.stream();
-  stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes.data()));  // zlib only reads it
-  stream.avail_in = static_cast<uInt>(bytes.size());
-  std::string output(deflateBound(&stream, bytes.size()), '\0');
-  if (deflation.failed(deflateWhole(stream, output))) return std::nullopt;
-  output.resize(stream.total_out);
+  if (!deflation.begin()) return std::nullopt;
+  deflation.give(bytes.data(), bytes.size());
+  std::string output(deflateBound(&deflation.stream, bytes.size()), '\0');
+  int result = deflation.run(Z_FINISH, output);
+  if (result == Z_OK)
+    result = deflate(&deflation.stream, Z_FINISH);  // without room, which is then the failure
+  if (result != Z_STREAM_END) {
+    deflation.sayFailure(result);
+    return std::nullopt;
+  }
+  output.resize(deflation.stream.total_out);
   output.shrink_to_fit();  // it may wait long for a server, and bounds count its size
   sayCompressed(bytes.size(), output.size());
   return output;
@@ -83,32 +153,26 @@ std::optional<std::string> deflateBytes(bool gzip, std::string_view bytes) {
 
 }  // namespace
 
-std::optional<std::string> compressDataWithZlibOrGzip(bool gzip, std::string_view bytes) {
+std::optional<std::string> gzipDeflate(std::string_view bytes) {
   if (bytes.empty()) {
     sayEmpty();
     return std::nullopt;
   }
-  // zlib counts its input in 32 bits; what does not fit must not be cut off silently.
-  if (bytes.size() > std::numeric_limits<uInt>::max()) {
-    logError("compressDataWithZlibOrGzip: Cannot compress %zu bytes: at most %u", bytes.size(),
-             std::numeric_limits<uInt>::max());
+  if (bytes.size() > kMostAtOnce) {
+    logError("compressDataWithZlibOrGzip: Cannot compress %zu bytes: at most %zu", bytes.size(), kMostAtOnce);
     return std::nullopt;
   }
   try {
-    return deflateBytes(gzip, bytes);
+    return deflateAtOnce(bytes);
   } catch (const std::bad_alloc&) {
     sayNoMemory();
     return std::nullopt;
   }
 }
 
-std::optional<std::string> gzipDeflate(std::string_view bytes) {
-  return compressDataWithZlibOrGzip(true, bytes);
-}
-
 bool gzipDeflate(const ByteSource& source, const ByteSink& sink) {
   try {
-    return deflateAll(source, sink);
+    return deflatePieces(source, sink);
   } catch (const std::bad_alloc&) {
     sayNoMemory();
     return false;

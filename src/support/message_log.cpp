@@ -4,15 +4,18 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cmath>
 #include <cstring>
 #include <ctime>
 #include <vector>
 
+#include "base/file_descriptor.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
 #include "platform/file_store.h"
@@ -23,25 +26,55 @@ namespace veltrad::support {
 namespace {
 constexpr double kExpirySeconds = 86'400;
 constexpr std::size_t kLineBytes = 128;  // what a line that waits keeps beside its text
+constexpr std::string_view kPrefix = "veltrad_";
+constexpr std::string_view kSuffix = "_messageLog.diag";
+
+double secondsOf(const struct statx_timestamp& time) {
+  return static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9;
+}
+
+// The part between the underscores of a name that is one of the daemon's log files.
+std::optional<std::string_view> secondsInLogFileName(std::string_view name) {
+  if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix) ||
+      name.size() < kPrefix.size() + kSuffix.size()) {
+    return std::nullopt;
+  }
+  name.remove_prefix(kPrefix.size());
+  name.remove_suffix(kSuffix.size());
+  if (name.find('_') != std::string_view::npos) return std::nullopt;
+  return name;
+}
+
+// Of the birth time and the modification time the earlier, in seconds since 1970; without a birth time the
+// seconds in the file's own name. Links are not followed.
+std::optional<double> creationDate(const std::string& path) {
+  struct statx facts {};
+  if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &facts) != 0)
+    return std::nullopt;
+  if ((facts.stx_mask & STATX_BTIME) != 0)
+    return std::min(secondsOf(facts.stx_btime), secondsOf(facts.stx_mtime));
+  const auto digits = secondsInLogFileName(std::string_view(path).substr(path.rfind('/') + 1));
+  long long number = 0;
+  if (!digits || std::from_chars(digits->data(), digits->data() + digits->size(), number).ec != std::errc()) {
+    return std::nullopt;
+  }
+  return static_cast<double>(number);
+}
+
+std::string filled(std::string_view format, std::initializer_list<std::string_view> values) {
+  std::string text;
+  for (const std::string_view value : values) {
+    const std::size_t place = format.find("%@");
+    text.append(format.substr(0, place)).append(value);
+    format.remove_prefix(place + 2);
+  }
+  return text.append(format);
+}
 
 std::string createdText(const std::optional<double>& created) {
   return created ? dateDescription(*created) : "(null)";
 }
 }  // namespace
-
-std::string filledFormat(std::string_view format, std::initializer_list<std::string_view> values) {
-  std::string text;
-  const auto* value = values.begin();
-  for (std::size_t at = 0; at < format.size(); ++at) {
-    if (format.substr(at, 2) == "%@" && value != values.end()) {
-      text += *value++;
-      ++at;
-    } else {
-      text += format[at];
-    }
-  }
-  return text;
-}
 
 std::string dateDescription(double secondsSince1970) {
   const auto whole = static_cast<std::time_t>(std::floor(secondsSince1970));
@@ -52,13 +85,13 @@ std::string dateDescription(double secondsSince1970) {
   return {text, length};
 }
 
-MessageLogFile::MessageLogFile(const platform::Clock& clock, std::string directory,
-                               platform::DiskWriter& writer, platform::Counters& counters)
+MessageLog::MessageLog(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer,
+                       platform::Counters& counters)
     : _clock(clock), _directory(std::move(directory)), _counters(counters), _queue(writer, kMostBytes) {}
 
-void MessageLogFile::writeToLogFile(std::string_view format, std::initializer_list<std::string_view> values) {
+void MessageLog::put(std::string_view format, std::initializer_list<std::string_view> values) {
   const double now = platform::timevalToSeconds(_clock.now());
-  std::string line = fmt::format("({}) {}\n", dateDescription(now), filledFormat(format, values));
+  std::string line = fmt::format("({}) {}\n", dateDescription(now), filled(format, values));
   const std::size_t bytes = line.size() + kLineBytes;
   using Put = platform::DiskWriter::Queue::Put;
   switch (_queue.put(
@@ -75,40 +108,26 @@ void MessageLogFile::writeToLogFile(std::string_view format, std::initializer_li
   }
 }
 
-bool MessageLogFile::append(const std::string& line) {
-  const double now = platform::timevalToSeconds(_clock.now());
-  if (!currentFileIsOpen(now) && !openCurrentFile()) return false;
-  if (!_current.append(line)) {
-    remove({_current.path(), _current.created()});
-    _current.close();
-    return false;
-  }
-  logInfo("writeToLogFile: Saved log message to %s", _current.path().c_str());
-  return true;
-}
-
-bool MessageLogFile::currentFileIsOpen(double now) const {
-  if (!_current.isCurrent(_directory)) return false;
-  const auto created = _current.created();
-  return created && now - *created <= kExpirySeconds;
-}
-
-bool MessageLogFile::openCurrentFile() {
-  _current.close();
-  const auto listed = DirectoryState::of(_directory);
+bool MessageLog::append(const std::string& line) {
   auto file = newestSurvivor();
   if (!file) file = createFile();
   if (!file) return false;
-  if (_current.open(file->path, listed)) return true;
-  remove(*file);
-  return false;
+  // Follows no link and waits for nothing.
+  const FileDescriptor opened(
+      open(file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+  if (write(opened.get(), line.data(), line.size()) != static_cast<ssize_t>(line.size())) {
+    remove(*file);
+    return false;
+  }
+  logInfo("writeToLogFile: Saved log message to %s", file->path.c_str());
+  return true;
 }
 
-std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
+std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
   DIR* listing = opendir(_directory.c_str());
   if (!listing && errno == ENOENT) {
     logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
-    platform::makeDirectories(_directory);
+    static_cast<void>(platform::makeDirectories(_directory));  // where it fails, so does making the file
     return std::nullopt;
   }
   if (!listing) {
@@ -126,7 +145,7 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
   std::optional<LogFile> newest;
   for (const std::string& name : names) {
     LogFile file{_directory + "/" + name, std::nullopt};
-    file.created = creationDate(AT_FDCWD, file.path);
+    file.created = creationDate(file.path);
     if (file.created && now - *file.created > kExpirySeconds) {
       remove(file);
     } else if (newest && newest->created) {
@@ -140,7 +159,7 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::newestSurvivor() {
   return newest;
 }
 
-std::optional<MessageLogFile::LogFile> MessageLogFile::createFile() {
+std::optional<MessageLog::LogFile> MessageLog::createFile() {
   LogFile file{fmt::format("{}/veltrad_{}_messageLog.diag", _directory, _clock.now().seconds), std::nullopt};
   const int made = open(file.path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
   if (made < 0) {
@@ -148,13 +167,13 @@ std::optional<MessageLogFile::LogFile> MessageLogFile::createFile() {
     return std::nullopt;
   }
   close(made);
-  file.created = creationDate(AT_FDCWD, file.path);
+  file.created = creationDate(file.path);
   logInfo("writeToLogFile: Created new veltrad log file %s (%s)", file.path.c_str(),
           createdText(file.created).c_str());
   return file;
 }
 
-void MessageLogFile::remove(const LogFile& file) {
+void MessageLog::remove(const LogFile& file) {
   ::remove(file.path.c_str());  // an empty directory of such a name, too
   logInfo("writeToLogFile: Deleted expired veltrad log file %s (%s)", file.path.c_str(),
           createdText(file.created).c_str());

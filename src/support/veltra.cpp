@@ -1,6 +1,7 @@
 // The client library's facts, from its resources and the preferences. Any thread.
 #include "support/veltra.h"
 
+#include "base/version.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
@@ -11,7 +12,6 @@
 namespace veltrad::support {
 
 namespace {
-constexpr const char* kVersionWhenNoneStated = "8.0";
 constexpr std::size_t kMostResourceBytes = 1u << 20;
 }  // namespace
 
@@ -23,22 +23,22 @@ Veltra::Veltra(platform::FileStore& files, platform::Preferences& preferences, c
 
 std::string Veltra::packageVersion() const {
   const auto stated = statedVersion();
-  return stated ? stated.value() : kVersionWhenNoneStated;
+  return stated ? stated.value() : kVersion;
 }
 
 Result<std::string, platform::FileFailure> Veltra::statedVersion() const {
   const auto bytes = _files.read(_manifestPath, kMostResourceBytes);
   if (!bytes && bytes.error().passes()) return Failure{bytes.error()};
-  if (!bytes) return std::string(kVersionWhenNoneStated);
+  if (!bytes) return std::string(kVersion);
   const auto list = formats::parsePropertyList(bytes.value());
   if (!list) {
     logWarning("The package manifest states no version: %s: %s", _manifestPath.c_str(),
                list.error().detail.c_str());
-    return std::string(kVersionWhenNoneStated);
+    return std::string(kVersion);
   }
   const Dictionary* manifest = list.value().asDictionary();
   const std::string* version = manifest ? manifest->string("version") : nullptr;
-  return version && !version->empty() ? *version : std::string(kVersionWhenNoneStated);
+  return version && !version->empty() ? *version : std::string(kVersion);
 }
 
 Result<std::string, platform::FileFailure> Veltra::publicKeyDER() const {

@@ -51,9 +51,7 @@ TEST(FileSnapshot, EndsWhereTheFileEndedAtFirst) {
 
 // Asked by each who waits, after he has taken his place in the row.
 struct Stoppable final : http::HTTPClient {
-  std::optional<http::HTTPError> start(http::HTTPRequest, http::HTTPCompletion) override {
-    return std::nullopt;
-  }
+  Result<Done, http::HTTPError> start(http::HTTPRequest, http::HTTPCompletion) override { return Done(); }
   http::HTTPResult perform(http::HTTPRequest) override { return Failure{http::HTTPError{}}; }
   bool stopping() const override {
     ++asked;

@@ -47,7 +47,7 @@ struct Configuration {
   platform::Root root{"/"};
   FakeDeviceProperties properties;
   support::DeviceIdentity device{properties};
-  MemoryPreferences preferences;
+  FakePreferences preferences;
   FakeFileStore files;
   config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   support::Veltra veltra{files, preferences, root};

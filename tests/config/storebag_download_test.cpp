@@ -22,18 +22,15 @@ const std::string kNoList = "3 " + kAt + "propertyListWithData error ";
 const std::string kMissing = "3 " + kAt + "Signature is missing";
 const std::string kNotVerified = "3 " + kAt + "Signature can not be verified, 0x";
 
-// One call, its lines and its slots.
-struct Fetch {
+using Kind = config::StorebagAnswer::Kind;
+
+// One call, its lines and what came of it.
+struct Fetch : config::WholeStorebagAnswer {
   Fetch(Configuration& configuration, const Lines& lines) {
     const ExpectedLog log(lines);
     config::StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
-    storebag = download.fetchStorebagWithName("ostvane", maxAge, notModified, &lastModified, attempted);
+    WholeStorebagAnswer::operator=(download.fetchStorebagWithName("ostvane", std::nullopt));
   }
-  std::optional<Dictionary> storebag;
-  std::int32_t maxAge = -77;
-  bool notModified = false;
-  bool attempted = true;
-  std::optional<std::string> lastModified;
 };
 
 TEST(CacheControl, GivesTheMaxAgeOrADay) {
@@ -58,7 +55,7 @@ TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
   const auto isNone = [&](const std::string& what) {
     const Fetch fetch(configuration, {});
     EXPECT_FALSE(fetch.attempted) << what;
-    EXPECT_EQ(fetch.storebag, std::nullopt) << what;
+    EXPECT_EQ(fetch.kind, Kind::failed) << what;
   };
   configuration.preferences.runShort(true);
   isNone("preferences");
@@ -73,6 +70,7 @@ TEST(StorebagDownload, IsNoAttemptDuringAShortage) {
     configuration.files.failReads(path, {});
   }
   const Fetch after(configuration, {});
+  EXPECT_EQ(after.kind, Kind::fetched);
   EXPECT_EQ(after.storebag, kStorebag);
   EXPECT_TRUE(after.attempted);
 }
@@ -101,9 +99,8 @@ TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
     configuration.answers(body, {{"Last-Modified", kTuesday}, {"Cache-Control", "max-age=600"}});
     SCOPED_TRACE(body);
     const Fetch fetch(configuration, lines);
-    EXPECT_EQ(fetch.storebag, std::nullopt);
+    EXPECT_EQ(fetch.kind, Kind::failed);
     EXPECT_EQ(fetch.maxAge, 600);
-    EXPECT_FALSE(fetch.notModified);
     EXPECT_EQ(fetch.lastModified, kTuesday);
   }
 }
@@ -121,7 +118,7 @@ TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
   EXPECT_FALSE(config::parseStorebagBag(writeBinaryPropertyList(Dictionary{{"deeper", bag}})));
 }
 
-struct Choice {
+struct Choice : config::StorebagSectionAnswer {
   Choice(int environment, const Dictionary& storebag, const Lines& lines,
          const char* cacheControl = "max-age=600") {
     const ExpectedLog log(lines);
@@ -129,15 +126,8 @@ struct Choice {
     configuration.answers(container(formats::writeXMLPropertyList(storebag)),
                           {{"Cache-Control", cacheControl}});
     config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
-    const auto chosen = sections.fetchStorebagForEnvironmentAndClientType(5, maxAge, version, notModified,
-                                                                          nullptr, attempted);
-    if (chosen) section = chosen->asGiven;
+    StorebagSectionAnswer::operator=(sections.fetchStorebagForEnvironmentAndClientType(5, std::nullopt));
   }
-  std::optional<Dictionary> section;
-  std::int32_t maxAge = -77;
-  std::optional<std::string> version = "as it was";
-  bool notModified = false;
-  bool attempted = true;
 };
 
 const std::string kChoosing = "fetchStorebagForEnvironmentAndClientType: ";
@@ -152,20 +142,20 @@ TEST(StorebagSections, ChooseByEnvironment) {
     return "3 " + kChoosing + "Could not find storebag for client type 5 with " + name + " environment";
   };
   using Text = std::optional<std::string>;
-  const Text kept = "as it was";
   const std::tuple<int, Dictionary, std::optional<Dictionary>, Text, Lines> table[] = {
       {1, full, kD, "7", {}},
       {2, full, kI, "7", {}},
       {3, full, kS, "7", {}},
       {4, full, kR, "7", {}},
       {3, noSeed, kR, {}, {missingSeed}},
-      {3, Dictionary{{"version", "7"}}, {}, kept, {missingSeed, none("seed")}},
-      {2, noSeed, {}, kept, {none("florn_internal")}},
-      {0, full, {}, kept, {none("(null)")}}};
+      {3, Dictionary{{"version", "7"}}, {}, {}, {missingSeed, none("seed")}},
+      {2, noSeed, {}, {}, {none("florn_internal")}},
+      {0, full, {}, {}, {none("(null)")}}};
   for (const auto& [environment, storebag, section, version, lines] : table) {
     SCOPED_TRACE(environment);
     const Choice fetch(environment, storebag, lines);
-    EXPECT_EQ(fetch.section, section);
+    EXPECT_EQ(fetch.kind, section ? Kind::fetched : Kind::failed);
+    EXPECT_EQ(fetch.section ? std::optional(fetch.section->asGiven) : std::nullopt, section);
     EXPECT_EQ(fetch.version, version);
     EXPECT_EQ(fetch.maxAge, 600);
   }

@@ -21,21 +21,19 @@ namespace {
 
 // Answers as the test says; may be told to hold an exchange until it is let go.
 struct Source final : config::StorebagSource {
-  std::shared_ptr<const config::StorebagSection> fetchStorebagForEnvironmentAndClientType(
-      std::int32_t, std::int32_t& maxAge, std::optional<std::string>& version, bool& notModified,
-      std::optional<std::string>* lastModified, bool& attempted) override {
-    attempted = attempts;
+  config::StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
+      std::int32_t, const std::optional<std::string>& lastModified) override {
+    using Kind = config::StorebagAnswer::Kind;
     std::unique_lock held(mutex);
     ++fetches;
     changed.notify_all();
     changed.wait(held, [this] { return !hold; });
     if (std::exchange(lacksMemory, false)) throw std::bad_alloc();
-    conditional = *lastModified;
-    maxAge = age;
-    notModified = answersNotModified;
-    if (section) version = "v" + std::to_string(fetches);
-    if (!newLastModified.empty()) *lastModified = newLastModified;
-    return section;
+    conditional = lastModified;
+    const Kind kind = section ? Kind::fetched : answersNotModified ? Kind::notModified : Kind::failed;
+    return {{kind, attempts, age, newLastModified.empty() ? lastModified : newLastModified},
+            section,
+            "v" + std::to_string(fetches)};
   }
   void waitForFetches(int count) {
     std::unique_lock held(mutex);

@@ -27,23 +27,23 @@ class FakeFileStore final : public platform::FileStore {
     if (file->bytes.size() > most) return Failure{failureOf(path, Kind::tooLarge)};
     return file->bytes;
   }
-  std::optional<platform::FileFailure> replace(const std::string& path, std::string_view bytes,
-                                               unsigned mode = 0600) override {
+  Result<Done, platform::FileFailure> replace(const std::string& path, std::string_view bytes,
+                                              unsigned mode = 0600) override {
     std::lock_guard lock(_mutex);
-    if (_short) return failureOf(path, Kind::shortage);
-    if (_writeFailure) return failureOf(path, *_writeFailure);
+    if (_short) return Failure{failureOf(path, Kind::shortage)};
+    if (_writeFailure) return Failure{failureOf(path, *_writeFailure)};
     _files[path] = {std::string(bytes), mode, ++_lastStamp};
     ++_replaced;
-    return std::nullopt;
+    return Done();
   }
-  std::optional<platform::FileFailure> rename(const std::string& from, const std::string& to) override {
+  Result<Done, platform::FileFailure> rename(const std::string& from, const std::string& to) override {
     std::lock_guard lock(_mutex);
-    if (_writeFailure) return failureOf(from, *_writeFailure);
+    if (_writeFailure) return Failure{failureOf(from, *_writeFailure)};
     const File* file = find(from);
-    if (!file) return failureOf(from, Kind::notFound);
+    if (!file) return Failure{failureOf(from, Kind::notFound)};
     _files[to] = *file;
     _files.erase(from);
-    return std::nullopt;
+    return Done();
   }
   Result<platform::FileStamp, platform::FileFailure> stamp(const std::string& path) override {
     std::lock_guard lock(_mutex);

@@ -15,9 +15,9 @@ class FakeHTTPClient final : public http::HTTPClient {
   using Answerer = std::function<http::HTTPResult(http::HTTPRequest)>;
   explicit FakeHTTPClient(Answerer answerer = nullptr) : _answerer(std::move(answerer)) {}
 
-  std::optional<http::HTTPError> start(http::HTTPRequest request, http::HTTPCompletion) override {
+  Result<Done, http::HTTPError> start(http::HTTPRequest request, http::HTTPCompletion) override {
     ADD_FAILURE() << "a post to " << request.url;
-    return std::nullopt;
+    return Done();
   }
   http::HTTPResult perform(http::HTTPRequest request) override { return _answerer(std::move(request)); }
 

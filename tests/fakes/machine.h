@@ -74,7 +74,7 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
 };
 
 // The real ones over files in memory.
-class MemoryPreferences {
+class FakePreferences {
  public:
   operator platform::Preferences&() { return _preferences; }
   // In the domain kVeltraPreferenceDomain.

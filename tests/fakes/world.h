@@ -23,7 +23,7 @@ struct World {
   FakeClock clock;
   FakeRandom random;
   FakeLocale locale;
-  MemoryPreferences preferences;
+  FakePreferences preferences;
   FakeDeviceProperties properties;
   FakeFileStore files;
   platform::Counters counters;

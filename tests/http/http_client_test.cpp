@@ -83,9 +83,9 @@ class HTTPClientTest : public testing::Test {
   std::future<http::HTTPResult> start(http::HTTPRequest request) {
     auto promise = std::make_shared<std::promise<http::HTTPResult>>();
     std::future<http::HTTPResult> future = promise->get_future();
-    auto refusal = client.start(
+    const auto started = client.start(
         std::move(request), [promise](http::HTTPResult result) { promise->set_value(std::move(result)); });
-    if (refusal) promise->set_value(Failure{std::move(*refusal)});
+    if (!started) promise->set_value(Failure{started.error()});
     return future;
   }
 
@@ -154,7 +154,7 @@ TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
       EXPECT_ERROR(client.perform(get("https://name.invalid/")), shortage, Not(testing::IsEmpty()));
       if (free > 0) continue;
       EXPECT_ERROR(client.perform(get(hung.url())), shortage, Not(testing::IsEmpty()));
-      EXPECT_EQ(client.start(get(hung.url()), [](http::HTTPResult) {}).has_value(), !started);
+      EXPECT_EQ(client.start(get(hung.url()), [](http::HTTPResult) {}).ok(), started);
     }
     EXPECT_TRUE(client.perform(post(healthy.url(), "1")).ok());
   }
@@ -181,18 +181,18 @@ TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
   for (int i = 0; i < 1024; ++i) {
     http::HTTPRequest request = post(hung.url(), "x");
     request.charge = *account->keep(1000);
-    const auto refusal = client.start(std::move(request), [&](http::HTTPResult result) {
+    const auto taken = client.start(std::move(request), [&](http::HTTPResult result) {
       EXPECT_GE(account->used(), 1000u);  // its own is paid back later
       if (!result.ok() && result.error().kind == http::HTTPError::Kind::stopping) ++stopped;
     });
-    EXPECT_FALSE(refusal);
+    EXPECT_TRUE(taken);
   }
   http::HTTPRequest one = post(healthy.url(), "y");
   one.charge = *account->keep(1000);
-  const auto refused = client.start(std::move(one), [](http::HTTPResult) { ADD_FAILURE(); });
-  ASSERT_TRUE(refused);
-  EXPECT_EQ(refused->kind, http::HTTPError::Kind::tooMany);
-  EXPECT_EQ(refused->description, "Too many posts under way");
+  const auto taken = client.start(std::move(one), [](http::HTTPResult) { ADD_FAILURE(); });
+  ASSERT_FALSE(taken);
+  EXPECT_EQ(taken.error().kind, http::HTTPError::Kind::tooMany);
+  EXPECT_EQ(taken.error().description, "Too many posts under way");
   EXPECT_EQ(client.underWay(), 1024u);
   EXPECT_EQ(account->used(), 1'024'000u);
 

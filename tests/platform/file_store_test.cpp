@@ -30,7 +30,7 @@ TEST_F(DiskFileStoreTest, ReplacesWholeWithTheModeAskedForAndLeavesNothingElse) 
   _directory.write("elsewhere", "untouched");
   std::filesystem::create_symlink("elsewhere", _directory.path("x"));
   const mode_t before = ::umask(077);
-  ASSERT_FALSE(_files.replace(_directory.path("x"), std::string_view("a\0b", 3), 0644));
+  ASSERT_TRUE(_files.replace(_directory.path("x"), std::string_view("a\0b", 3), 0644));
   ::umask(before);
   EXPECT_EQ(_files.read(_directory.path("x"), kMost).value(), std::string("a\0b", 3));
   struct stat status {};
@@ -51,12 +51,12 @@ TEST_F(DiskFileStoreTest, AFailureLeavesTheOldFileAndNoNewOne) {
   const auto full = _files.replace(_directory.path("x"), std::string(10'000, 'n'), 0600);
   ::setrlimit(RLIMIT_FSIZE, &before);
   ::signal(SIGXFSZ, handler);
-  ASSERT_TRUE(full);
-  EXPECT_EQ(full->kind, Kind::tooLarge);
+  ASSERT_FALSE(full);
+  EXPECT_EQ(full.error().kind, Kind::tooLarge);
   EXPECT_EQ(_directory.read("x"), "old");
   const auto occupied = _files.replace(_directory.path("directory"), "new", 0600);
-  ASSERT_TRUE(occupied);
-  EXPECT_THAT(occupied->description, HasSubstr(_directory.path("directory") + ": "));
+  ASSERT_FALSE(occupied);
+  EXPECT_THAT(occupied.error().description, HasSubstr(_directory.path("directory") + ": "));
   EXPECT_THAT(_directory.names(), UnorderedElementsAre("x", "directory"));
 }
 

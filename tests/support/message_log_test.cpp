@@ -32,7 +32,7 @@ class MessageLogTest : public ::testing::Test {
     return "(" + support::dateDescription(double(seconds)) + ") ";
   }
   void write(const std::string& text = "text %@ 5%") {
-    _messages.writeToLogFile("[%@ -> %@", {"b", text});
+    _messages.writeToLogFile("[%@ -> %@", "b", text);
     EXPECT_TRUE(_writer.drain(std::chrono::steady_clock::now() + std::chrono::seconds(10)));
   }
 
@@ -43,7 +43,7 @@ class MessageLogTest : public ::testing::Test {
   FakeClock _clock{{_now, 900'000}};
   platform::Counters _counters;
   platform::DiskWriter _writer;
-  support::MessageLogFile _messages{_clock, _place.path(), _writer, _counters};
+  support::MessageLog _messages{_clock, _place.path(), _writer, _counters};
   const std::string _current = _place.path(nameAt(_now));
 };
 
@@ -126,7 +126,7 @@ TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
   other.put([&] { begun.count_down(), stalled.wait(); }, 1);
   begun.wait();
   const std::string megabyte(1 << 20, 'x');
-  for (int i = 0; i < 6; ++i) _messages.writeToLogFile("%@", {megabyte});
+  for (int i = 0; i < 6; ++i) _messages.writeToLogFile("%@", megabyte);
   EXPECT_EQ(_counters.value(wire::Reason::log_line_queue_full), 3u);
   const std::string stamp = dateAt(_now);
   _clock.advance(60);  // a line has the time at which it was logged

@@ -65,7 +65,9 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
     auto error = handleAnswer(*backEnd, result, postedTo, eventCount);
     if (completion) completion(std::nullopt, std::move(error));
   };
-  if (auto refusal = _http.start(std::move(request), answered)) answered(Failure{std::move(*refusal)});
+  if (const auto started = _http.start(std::move(request), answered); !started) {
+    answered(Failure{started.error()});
+  }
 }
 
 void EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,

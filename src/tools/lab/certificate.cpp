@@ -78,9 +78,10 @@ std::optional<std::string> makeCertificate(const std::string& certificatePath, c
       PEM_write_bio_X509(certificateText.get(), certificate.get()) != 1)
     return "OpenSSL could not make a certificate for localhost";
   platform::DiskFileStore files;
-  if (const auto failure = files.replace(keyPath, bytesOf(keyText.get()), 0600)) return failure->description;
-  if (const auto failure = files.replace(certificatePath, bytesOf(certificateText.get()), 0644))
-    return failure->description;
+  if (const auto written = files.replace(keyPath, bytesOf(keyText.get()), 0600); !written)
+    return written.error().description;
+  if (const auto written = files.replace(certificatePath, bytesOf(certificateText.get()), 0644); !written)
+    return written.error().description;
   return std::nullopt;
 }
 

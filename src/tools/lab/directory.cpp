@@ -86,13 +86,14 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
 std::optional<std::string> makeSigningKey(const std::string& privatePath, const std::string& publicPath) {
   platform::DiskFileStore files;
   if (!exists(privatePath)) {
-    if (const auto failure = files.replace(privatePath, config::SigningKey::generate().privatePEM(), 0600))
-      return failure->description;
+    if (const auto written = files.replace(privatePath, config::SigningKey::generate().privatePEM(), 0600);
+        !written)
+      return written.error().description;
   }
   const auto key = config::SigningKey::load(privatePath);
   if (!key) return key.error();
-  if (const auto failure = files.replace(publicPath, key.value().publicDER(), 0644))
-    return failure->description;
+  if (const auto written = files.replace(publicPath, key.value().publicDER(), 0644); !written)
+    return written.error().description;
   return std::nullopt;
 }
 
@@ -101,12 +102,14 @@ std::optional<std::string> makeSigningKey(const std::string& privatePath, const 
 Result<Directory, std::string> Directory::open(const std::string& path) {
   const bool first = !exists(path + "/storebags");
   for (const char* part : {"/storebags", "/received", "/signing"}) {
-    if (const auto failure = platform::makeDirectories(path + part)) return Failure{failure->description};
+    if (const auto made = platform::makeDirectories(path + part); !made)
+      return Failure{made.error().description};
   }
   platform::DiskFileStore files;
   if (first) {
-    if (const auto failure = files.replace(path + "/storebags/quindle.json", kExampleStorebag, 0644))
-      return Failure{failure->description};
+    if (const auto written = files.replace(path + "/storebags/quindle.json", kExampleStorebag, 0644);
+        !written)
+      return Failure{written.error().description};
   }
   const std::string privatePath = path + "/signing/private.pem";
   if (const auto failure = makeSigningKey(privatePath, path + "/signing/publicKey.der"))

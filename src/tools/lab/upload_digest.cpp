@@ -4,6 +4,8 @@
 #include <openssl/evp.h>
 #include <zlib.h>
 
+#include "base/text.h"
+
 namespace veltrad::lab {
 namespace {
 
@@ -14,12 +16,7 @@ std::string hexDigest(EVP_MD_CTX* context) {
   unsigned char digest[EVP_MAX_MD_SIZE];
   unsigned length = 0;
   EVP_DigestFinal_ex(context, digest, &length);
-  std::string text;
-  for (unsigned i = 0; i < length; ++i) {
-    text += "0123456789abcdef"[digest[i] >> 4];
-    text += "0123456789abcdef"[digest[i] & 15];
-  }
-  return text;
+  return hex({reinterpret_cast<const char*>(digest), length});
 }
 
 }  // namespace

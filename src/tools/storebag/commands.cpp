@@ -109,7 +109,7 @@ Outcome keygen(const std::string& directory, int bits) {
   const std::string publicPath = directory + "/" + kPublicKeyFile;
   for (const std::string& path : {privatePath, publicPath})
     if (exists(path)) return refused(path + ": exists already; keys are never overwritten");
-  if (const auto failure = platform::makeDirectories(directory)) return refused(failure->description);
+  if (const auto made = platform::makeDirectories(directory); !made) return refused(made.error().description);
   const config::SigningKey key = config::SigningKey::generate(bits);
   if (const auto failure = writeNew(privatePath, key.privatePEM(), 0600)) return refused(*failure);
   if (const auto failure = writeNew(publicPath, key.publicDER(), 0644)) {
@@ -133,7 +133,8 @@ Outcome sign(const std::string& privateKey, const std::string& in, const std::st
     return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", in, container.size(),
                                config::kStorebagMostContainerBytes));
   platform::DiskFileStore files;
-  if (const auto failure = files.replace(out, container, 0644)) return refused(failure->description);
+  if (const auto written = files.replace(out, container, 0644); !written)
+    return refused(written.error().description);
   return done("");
 }
 

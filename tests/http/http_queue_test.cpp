@@ -1,5 +1,5 @@
 // The queue of requests that wait for a connection: what runs next.
-#include "http/http_waiting.h"
+#include "http/http_queue.h"
 
 #include <gtest/gtest.h>
 
@@ -38,31 +38,31 @@ class Requests {
         request.url = std::string("https://") + come.host + "/path";
         request.sequence = come.sequence;
         request.timeout = 1s;
-        http::HTTPInbox::Transfers one;
-        one.push_back(std::make_unique<http::CurlTransfer>(std::move(request), nullptr, false, kNow));
-        waiting.add(one);
+        http::HTTPQueue::Transfers one;
+        one.emplace_back(std::move(request), nullptr, false, kNow);
+        EXPECT_NE(queue.add(one), http::HTTPQueue::Added::full);
       }
     }
   }
   std::string begin(std::chrono::milliseconds after) {
     std::string hosts;
-    while (auto transfer = waiting.next(kNow + after)) {
-      hosts += transfer->host();
-      running.push_back(std::move(transfer));
+    for (auto one = queue.next(kNow + after); !one.empty(); one = queue.next(kNow + after)) {
+      hosts += one.front().host();
+      running.splice(running.end(), one);
     }
     return hosts;
   }
   void endFirst() {
     if (running.empty()) return;
-    waiting.ended(*running.front());
+    queue.ended(running.front());
     running.pop_front();
   }
 
-  http::HTTPWaiting waiting;
-  http::HTTPInbox::Transfers running;
+  http::HTTPQueue queue;
+  http::HTTPQueue::Transfers running;
 };
 
-TEST(HTTPWaiting, WhatRunsNext) {
+TEST(HTTPQueue, WhatRunsNext) {
   const Case cases[] = {
       {"storebags are never held back, and go first",
        {{Lane::event, "a", 7}, {Lane::storebag, "a", 9}},
@@ -100,11 +100,11 @@ TEST(HTTPWaiting, WhatRunsNext) {
       run.endFirst();
       run.begin(0ms);
     }
-    EXPECT_TRUE(run.waiting.empty());  // every place was given back, so all could run
+    EXPECT_TRUE(run.queue.empty());  // every place was given back, so all could run
   }
 }
 
-TEST(HTTPWaiting, TakesOutWhatIsExpiredButNotWhatWaitsForItsLane) {
+TEST(HTTPQueue, TakesOutWhatIsExpiredButNotWhatWaitsForItsLane) {
   Requests run(
       {"",
        {{Lane::event, "a", 2}, {Lane::logData, "b", 1}, {Lane::storebag, "c", 1}, {Lane::upload, "d", 1}},
@@ -112,8 +112,8 @@ TEST(HTTPWaiting, TakesOutWhatIsExpiredButNotWhatWaitsForItsLane) {
   const auto expired = [](auto after) {
     return [now = kNow + after](const http::CurlTransfer& transfer) { return transfer.expired(now); };
   };
-  EXPECT_EQ(run.waiting.take(expired(999ms)).size(), 0u);
-  EXPECT_EQ(run.waiting.take(expired(1s)).size(), 3u);
+  EXPECT_EQ(run.queue.take(expired(999ms)).size(), 0u);
+  EXPECT_EQ(run.queue.take(expired(1s)).size(), 3u);
   EXPECT_EQ(run.begin(2s), "db");
 }
 

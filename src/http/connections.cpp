@@ -1,12 +1,17 @@
-// The certificate authorities that HTTPS connections trust. HTTP thread.
-#include "http/trust_store.h"
+// The sockets of libcurl's connections, and whom these trust.
+#include "http/connections.h"
 
+#include <netinet/in.h>
 #include <openssl/err.h>
 #include <openssl/x509.h>
 #include <openssl/x509_vfy.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <new>
+#include <utility>
 
 #include "platform/log.h"
 #include "platform/shortage.h"
@@ -14,6 +19,21 @@
 namespace veltrad::http {
 
 namespace {
+
+int localPortOf(curl_socket_t socket) {
+  sockaddr_storage address{};
+  socklen_t length = sizeof address;
+  if (getsockname(socket, reinterpret_cast<sockaddr*>(&address), &length) != 0) return -1;
+  if (address.ss_family == AF_INET) return ntohs(reinterpret_cast<const sockaddr_in&>(address).sin_port);
+  if (address.ss_family == AF_INET6) return ntohs(reinterpret_cast<const sockaddr_in6&>(address).sin6_port);
+  return -1;
+}
+
+bool somethingWaits(curl_socket_t socket) {
+  char byte = 0;
+  const ssize_t length = recv(socket, &byte, 1, MSG_PEEK | MSG_DONTWAIT);
+  return length >= 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR);
+}
 
 // Empties the queue. OpenSSL files what the system said under the number that errno had.
 bool shortageInErrorQueue() {
@@ -28,25 +48,50 @@ bool shortageInErrorQueue() {
 
 }  // namespace
 
-bool TrustStore::Stamp::operator==(const Stamp& other) const {
+bool Connections::Stamp::operator==(const Stamp& other) const {
   return device == other.device && file == other.file && size == other.size &&
          modified.tv_sec == other.modified.tv_sec && modified.tv_nsec == other.modified.tv_nsec;
 }
 
-void TrustStore::Free::operator()(X509_STORE* store) const {
+void Connections::Free::operator()(X509_STORE* store) const {
   X509_STORE_free(store);
 }
 
-TrustStore::TrustStore(std::string extraCertificatesPath)
+Connections::Connections(std::string extraCertificatesPath)
     : _extraCertificatesPath(std::move(extraCertificatesPath)) {}
 
-TrustStore::~TrustStore() = default;
+Connections::~Connections() = default;
 
-X509_STORE* TrustStore::current() {
+curl_socket_t Connections::open(const curl_sockaddr& address) {
+  try {
+    _sockets.reserve(_sockets.size() + 1);
+  } catch (const std::bad_alloc&) {
+    errno = ENOMEM;
+    return CURL_SOCKET_BAD;
+  }
+  const curl_socket_t made = socket(address.family, address.socktype | SOCK_CLOEXEC, address.protocol);
+  if (made != CURL_SOCKET_BAD) _sockets.push_back(made);
+  return made;
+}
+
+int Connections::close(void* self, curl_socket_t socket) {
+  auto& sockets = static_cast<Connections*>(self)->_sockets;
+  sockets.erase(std::remove(sockets.begin(), sockets.end(), socket), sockets.end());
+  return ::close(socket);
+}
+
+bool Connections::ended(int localPort) const {
+  // Connections to different servers may share a local port; in doubt a new one is made.
+  return std::any_of(_sockets.begin(), _sockets.end(), [localPort](curl_socket_t socket) {
+    return localPortOf(socket) == localPort && somethingWaits(socket);
+  });
+}
+
+X509_STORE* Connections::trusted() {
   const std::optional<Stamp> now =
       stampNow();  // before the reading: a file that changes meanwhile is read again
   if (now && (!_store || !(*now == _stamp))) {
-    if (Store fresh = make(now->size >= 0)) {
+    if (Store fresh = makeStore(now->size >= 0)) {
       _store = std::move(fresh);
       _stamp = *now;
     }
@@ -54,7 +99,7 @@ X509_STORE* TrustStore::current() {
   return _store.get();
 }
 
-std::optional<TrustStore::Stamp> TrustStore::stampNow() const {
+std::optional<Connections::Stamp> Connections::stampNow() const {
   struct stat found {};
   if (_extraCertificatesPath.empty()) return Stamp{};
   if (stat(_extraCertificatesPath.c_str(), &found) == 0)
@@ -62,7 +107,7 @@ std::optional<TrustStore::Stamp> TrustStore::stampNow() const {
   return platform::isShortage(errno) ? std::nullopt : std::optional(Stamp{});
 }
 
-TrustStore::Store TrustStore::make(bool withExtra) const {
+Connections::Store Connections::makeStore(bool withExtra) const {
   ERR_clear_error();
   Store store(X509_STORE_new());
   if (!store) return store;

@@ -1,0 +1,8 @@
+// The one file that is compiled again when the version changes.
+#include "base/version.h"
+
+namespace veltrad {
+
+const char* const kVersion = VELTRA_VERSION;
+
+}  // namespace veltrad
