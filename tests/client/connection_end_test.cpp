@@ -42,40 +42,6 @@ TEST(ConnectionEnd, ADaemonThatDoesNotReadFillsTheQueueAndLosesNothingThatWasAcc
   EXPECT_EQ(session.close(), 0u);
 }
 
-TEST(ConnectionEnd, EndsEveryCallOnceWhenTheDaemonGoes) {
-  std::uint32_t first = 0;
-  int wanted = 12;
-  FakeDaemon daemon([&](WireEnd& link, const Received& call) {
-    if (call.callID == 0) return;
-    if (first == 0) first = call.callID;
-    if (--wanted > 0) return;
-    link.send(replyFrame(first, {{"reply", "the last word"}}));  // still to be read behind the end
-    link.hangUp();
-  });
-  veltra::Session session = open(daemon);
-  std::vector<std::future<veltra::Reply>> futures;
-  for (int i = 0; i < 8; ++i) futures.push_back(session.send(1, 1));
-  std::vector<std::thread> waiters;
-  for (int i = 0; i < 4; ++i) {
-    waiters.emplace_back([&] {
-      const veltra::Reply reply = session.flush();
-      EXPECT_EQ(reply.status, VELTRA_NO_REPLY);
-      EXPECT_EQ(textOf(reply), kEnded);
-    });
-  }
-  for (std::thread& waiter : waiters) waiter.join();
-  for (auto& future : futures)
-    EXPECT_EQ(textOf(future.get()), &future == &futures[0] ? "the last word" : kEnded);
-  EXPECT_EQ(session.send(1, 1).get().status, VELTRA_NO_DAEMON);
-  EXPECT_EQ(session.start().error().description, "No daemon listens, or the connection to it has ended.");
-  const veltra::Statistics counts = session.statistics();
-  EXPECT_EQ(counts.replies, 1u);
-  EXPECT_EQ(counts.unanswered, 11u);
-  EXPECT_EQ(counts.sent, 12u);
-  EXPECT_EQ(counts.dropped, 2u);
-  EXPECT_EQ(session.close(), 0u);
-}
-
 TEST(ConnectionEnd, ClosingWritesOutWhatWaitsAndEndsWhatIsUnanswered) {
   Gate reading;
   Journal ended;
@@ -108,20 +74,6 @@ TEST(ConnectionEnd, ClosingGivesUpAfterTwoSecondsAndSaysWhatWasLost) {
   EXPECT_GE(taken, std::chrono::milliseconds(1900));
   EXPECT_LT(taken, std::chrono::seconds(10));
   done.open();
-}
-
-TEST(ConnectionEnd, ClosingEndsThreadsThatWait) {
-  Journal asked;
-  FakeDaemon daemon([&](WireEnd&, const Received& call) { asked.add(call.op()); });
-  Handle session = openHandle(daemon);
-  std::vector<std::thread> waiters;
-  for (int i = 0; i < 3; ++i) {
-    waiters.emplace_back(
-        [handle = session.get()] { EXPECT_EQ(veltra_session_flush_wait(handle, nullptr), VELTRA_NO_REPLY); });
-  }
-  EXPECT_TRUE(asked.waitForLines(4));
-  EXPECT_EQ(veltra_session_close(session.release()), 0u);
-  for (std::thread& waiter : waiters) waiter.join();
 }
 
 }  // namespace

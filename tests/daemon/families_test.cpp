@@ -190,43 +190,6 @@ TEST(Families, ANegativeLevelHasNoParent) {
   EXPECT_EQ(log.count(RecordedLog::Level::info, "Unable to find session with hierarchy of -2"), 1);
 }
 
-TEST(Families, ASessionIsInTheListOfWhatItLastTold) {
-  RecordedLog log;
-  World world;
-  Session& root = world.join("A0!");
-  Session& child = world.join("B1");
-  Session& tablet = world.join("C0!@tablet");
-  child.identify("tablet");
-  EXPECT_EQ(world.copyOf(child), "C");  // a message before the families were told of it
-  world.refresh(child);
-  EXPECT_EQ(world.look(), "A=2A! C.B=2C C=2C!");
-  EXPECT_EQ(world.families.userInfoKeyCount(), 2u);
-
-  // Given anew, not started: still in its list, which its key no longer names.
-  child.identify("phone");
-  world.families.sessionInfoUpdated(child.facts());
-  EXPECT_EQ(world.copyOf(child), "A");
-  world.families.updateDownstreamSessions(tablet.facts());
-  for (const char* operation : {"parentSessionIDStringForSession", "parentSessionForChild"}) {
-    log.expectLine(RecordedLog::Level::error,
-                   std::string(operation) + ": ERROR: Session 66 not found for user info key phone:ringer");
-  }
-  child.userInfo = nullptr;
-  world.refresh(child);
-  EXPECT_EQ(world.copyOf(child), "");
-  world.families.updateDownstreamSessions(tablet.facts());
-  for (const char* operation : {"parentSessionIDStringForSession", "parentSessionForChild"}) {
-    log.expectLine(RecordedLog::Level::error,
-                   std::string(operation) + ": ERROR: No sessions found for user info key :");
-  }
-
-  world.families.leave(*child.aggregation);
-  world.families.leave(*root.aggregation);
-  EXPECT_EQ(world.families.userInfoKeyCount(), 2u);  // an emptied list stays
-  world.join("D1");
-  EXPECT_EQ(world.look(), "A=2A! C.B=2C C=2C! D=2D");
-}
-
 TEST(Families, EmptiedListsStayWithinABound) {
   const RecordedLog log;
   World world;

@@ -5,6 +5,11 @@
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t size) {
   using namespace veltrad;
   const auto read = parseBinaryPropertyList({reinterpret_cast<const char*>(bytes), size});
+  // Whatever the bytes declare, no more memory is taken than the limit says.
+  PropertyListLimits little;
+  little.memory = 16u << 10;
+  const auto small = parseBinaryPropertyList({reinterpret_cast<const char*>(bytes), size}, little);
+  if (small.ok() && keptBytes(small.value()) > little.memory) std::abort();
   if (!read.ok()) return 0;
   // Written out, shared objects are each their own: no limit that counted them at each place is passed.
   fuzz::mustBe(read.value(), parseBinaryPropertyList(writeBinaryPropertyList(read.value())));

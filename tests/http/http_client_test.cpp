@@ -206,36 +206,5 @@ TEST_F(HTTPClientTest, EventPostsAreBoundedAndStorebagsAreNot) {
   EXPECT_EQ(start(get(healthy.url())).get().error().kind, http::HTTPError::Kind::stopping);
 }
 
-TEST_F(HTTPClientTest, TheDestructorEndsAllOnceEvenWhatCompletionsAskFor) {
-  std::atomic<int> first{0}, second{0};
-  {
-    http::CurlHTTPClient mine({place.path("ca.pem")});
-    for (int i = 0; i < 10; ++i) {
-      (void)mine.start(post(hung.url(), "x"), [&](http::HTTPResult) {
-        ++first;
-        (void)mine.start(post(hung.url(), "again"), [&](http::HTTPResult result) {
-          if (result.error().kind == http::HTTPError::Kind::stopping) ++second;
-        });
-      });
-    }
-    ASSERT_TRUE(hung.waitForRequests(6));
-  }
-  EXPECT_EQ(first, 10);
-  EXPECT_EQ(second, 10);
-}
-
-TEST_F(HTTPClientTest, AnEmptyTaskPassesUnlessACompletionHoldsTheThread) {
-  EXPECT_TRUE(client.passesEmptyTask(0ms));  // no thread yet
-  std::promise<void> entered, leave;
-  (void)client.start(get("http://refused/"), [&](http::HTTPResult) {
-    entered.set_value();
-    leave.get_future().wait();
-  });
-  entered.get_future().wait();
-  EXPECT_FALSE(client.passesEmptyTask(1ms));
-  leave.set_value();
-  EXPECT_TRUE(client.passesEmptyTask(10s));
-}
-
 }  // namespace
 }  // namespace veltrad::platform

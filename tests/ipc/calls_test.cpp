@@ -76,20 +76,5 @@ TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   EXPECT_EQ(last.results(), R"({"reply":"late"})");
 }
 
-TEST(Replies, MayOutliveTheConnection) {
-  wire::StringReply late;
-  Door door;
-  door.onMessage = [&](std::uint16_t, wire::StringReply reply) { late = std::move(reply); };
-  WireEnd client = door.client();
-  client.send(messageFrame(1));
-  client.hangUp(SHUT_WR);
-  EXPECT_TRUE(door.journal.waitFor("end"));
-  EXPECT_TRUE(client.atEnd());
-  EXPECT_EQ(door.stop(), 0u);
-  late("nobody is there");
-  EXPECT_EQ(door.counters.value(wire::Reason::reply_client_gone), 1u);
-  late = nullptr;  // before the counters go
-}
-
 }  // namespace
 }  // namespace veltrad::ipc_test

@@ -37,19 +37,6 @@ TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
   EXPECT_EQ(value("ReleaseType"), Text());
 }
 
-TEST_F(MachinePropertiesTest, TheDeviceIDIsFortyDigitsThatOnlyTheMachineIDChanges) {
-  const std::string id = "3d1219c7c4c5404aaa1f6d2a48adfda4";
-  _files.put("/etc/machine-id", id + "\n");
-  const auto device = value("UniqueDeviceID");
-  EXPECT_THAT(device.value_or(""), ::testing::MatchesRegex("[0-9a-f]{40}"));
-  // Not what any other program makes of it that takes the bare SHA-256.
-  EXPECT_NE(device, "0035969ec53f6e7f0fb40f08cc9ed4783aa99c20");
-  _files.put("/etc/machine-id", "4d1219c7c4c5404aaa1f6d2a48adfda4\n");
-  EXPECT_NE(value("UniqueDeviceID"), device);
-  _files.put("/etc/machine-id", "uninitialized\n");
-  EXPECT_EQ(value("UniqueDeviceID"), Text());
-}
-
 // Neither the machine nor a default is asked instead: it may say something else.
 TEST_F(MachinePropertiesTest, DuringAShortageWhatWasLastReadServesOrNothing) {
   put({{"SerialNumber", "S1"}});

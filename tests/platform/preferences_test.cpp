@@ -3,13 +3,9 @@
 
 #include <gtest/gtest.h>
 
-#include <set>
-#include <thread>
-
 #include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
-#include "fakes/temporary_directory.h"
 #include "platform/uuid.h"
 
 namespace veltrad::platform {
@@ -98,21 +94,6 @@ TEST_F(FilePreferencesTest, AShortageIsNoAnswer) {
   _files.runShort(false);
   EXPECT_EQ(_preferences.textOrStore(kDomain, "new", platform::randomUUIDText), made);
   EXPECT_EQ(platform::FilePreferences(_files, "/preferences").text(kDomain, "new"), made);
-}
-
-TEST(FilePreferencesOnDisk, ManyCallersAtOnceGetOneText) {
-  RecordedLog log;
-  TemporaryDirectory directory;
-  platform::DiskFileStore files;
-  platform::FilePreferences preferences(files, directory.path());
-  std::vector<std::optional<std::string>> texts(4);
-  std::vector<std::thread> callers;
-  for (auto& text : texts) {
-    callers.emplace_back([&] { text = preferences.textOrStore(kDomain, "id", platform::randomUUIDText); });
-  }
-  for (auto& caller : callers) caller.join();
-  EXPECT_EQ(std::set(texts.begin(), texts.end()).size(), 1u);
-  EXPECT_EQ(platform::FilePreferences(files, directory.path()).text(kDomain, "id"), texts[0]);
 }
 
 }  // namespace

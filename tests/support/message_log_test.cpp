@@ -109,17 +109,6 @@ TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) 
   EXPECT_EQ(_place.read("elsewhere"), "foreign");
 }
 
-TEST_F(MessageLogTest, AClockThatJumpsLeavesOneFile) {
-  const std::int64_t later = _now + 172'800;
-  write();
-  for (const double jump : {172'800., -172'800.}) {
-    _clock.advance(jump);
-    write();
-    EXPECT_THAT(_place.names(), ElementsAre(nameAt(later)));
-  }
-  EXPECT_EQ(_place.read(nameAt(later)), dateAt(later) + "[b -> text %@ 5%\n" + _line);
-}
-
 TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
   platform::DiskWriter::Queue other(_writer, 1);
   std::latch begun(1), stalled(1);

@@ -47,38 +47,6 @@ class StorebagCommands : public testing::Test {
   const std::string privateKey = path("keys/privateKey.pem"), publicKey = path("keys/publicKey.der");
 };
 
-TEST_F(StorebagCommands, KeygenMakesAPairAndNeverOverwritesOne) {
-  EXPECT_EQ(std::filesystem::status(privateKey).permissions(), std::filesystem::perms(0600));
-  const std::string pem = read("keys/privateKey.pem");
-  std::filesystem::remove(publicKey);
-  EXPECT_THAT(refusal(storebag::keygen(path("keys"), config::SigningKey::kFewestBits)),
-              HasSubstr(privateKey + ": exists already"));
-  EXPECT_EQ(read("keys/privateKey.pem"), pem);
-  EXPECT_FALSE(std::filesystem::exists(publicKey));
-}
-
-TEST_F(StorebagCommands, SignsEveryFormSoThatItVerifiesAndShows) {
-  const std::string json = formats::writeJSON(kStorebag);
-  for (const std::string& bytes :
-       {formats::writeXMLPropertyList(kStorebag), writeBinaryPropertyList(kStorebag), json}) {
-    const std::string in = file("in", bytes), out = path("out");
-    const Outcome sign = storebag::sign(privateKey, in, out);
-    ASSERT_TRUE(sign.done) << sign.text;
-    EXPECT_EQ(storebag::verify(publicKey, out).text, out + ": the signature holds\n");
-    const auto decoded = config::decodeStorebagContainer(config::parseStorebagContainer(read("out")).value());
-    ASSERT_TRUE(decoded);
-    EXPECT_EQ(decoded->bag, bytes == json ? formats::writeXMLPropertyList(kStorebag) : bytes);
-    for (const std::string& shown : {in, out}) {
-      EXPECT_EQ(storebag::show(shown, true).text, json + "\n");
-      EXPECT_EQ(formats::parseJSON(storebag::show(shown, false).text).value(), Value(kStorebag));
-      EXPECT_EQ(storebag::lint(shown).text, "nothing found\n");
-    }
-  }
-  const Outcome lint = storebag::lint(file("in", "{\"version\":\"1\"}"));
-  EXPECT_TRUE(lint.done && lint.findings);
-  EXPECT_THAT(lint.text, testing::StartsWith("storebag: no \"release\": "));
-}
-
 TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
   Dictionary deep;
   for (int i = 0; i < 40; ++i) deep = Dictionary{{"deeper", deep}};

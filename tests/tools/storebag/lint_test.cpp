@@ -107,23 +107,5 @@ TEST(StorebagLint, SaysWhatAnEntryWouldDo) {
   }
 }
 
-TEST(StorebagLint, SaysWhatTheRestWouldDo) {
-  Dictionary everyone = kGood;
-  everyone.erase("client");
-  Dictionary oneService = everyone;
-  oneService.set("service", "ringer");
-  const std::pair<Dictionary, const char*> table[] = {
-      {storebagWith(Dictionary{{"httpost", 1}}),
-       R"(release: unknown back end "httpost": expected one of dash)"},
-      {storebagWith(Dictionary{{"uploadserver", Dictionary{{"post_url", "u.example"}}}}),
-       R"(release.uploadserver: "post_url" does not begin with https://: )"},
-      {clients(Array{}), R"(release.httppost: "clients" is empty: refuses every client)"},
-      {clients(Array{everyone, kGood}), "release.httppost.clients[1]: never used for a client that requires"},
-  };
-  for (const auto& [bag, finding] : table)
-    EXPECT_THAT(lintStorebag(bag), testing::ElementsAre(testing::StartsWith(finding)));
-  EXPECT_THAT(lintStorebag(clients(Array{kGood, oneService, everyone})), testing::IsEmpty());
-}
-
 }  // namespace
 }  // namespace veltrad
