@@ -91,7 +91,8 @@ MessageLog::MessageLog(const platform::Clock& clock, std::string directory, plat
 
 void MessageLog::put(std::string_view format, std::initializer_list<std::string_view> values) {
   const double now = platform::timevalToSeconds(_clock.now());
-  std::string line = fmt::format("({}) {}\n", dateDescription(now), filled(format, values));
+  std::string line = filled(format, values);
+  line.insert(0, "(" + dateDescription(now) + ") ").push_back('\n');
   const std::size_t bytes = line.size() + kLineBytes;
   using Put = platform::DiskWriter::Queue::Put;
   switch (_queue.put(
@@ -124,21 +125,27 @@ bool MessageLog::append(const std::string& line) {
 }
 
 std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
-  DIR* listing = opendir(_directory.c_str());
-  if (!listing && errno == ENOENT) {
+  const FileDescriptor directory(open(_directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!directory.isOpen() && errno == ENOENT) {
     logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
     static_cast<void>(platform::makeDirectories(_directory));  // where it fails, so does making the file
     return std::nullopt;
   }
-  if (!listing) {
+  if (!directory.isOpen()) {
     logError("writeToLogFile: Error reading from log directory: %s", std::strerror(errno));
     return std::nullopt;
   }
   std::vector<std::string> names;
-  while (const dirent* entry = readdir(listing)) {
-    if (secondsInLogFileName(entry->d_name)) names.emplace_back(entry->d_name);
+  // opendir() would allocate 32 KiB for each line.
+  alignas(dirent64) char entries[4096];
+  ssize_t bytes;
+  while ((bytes = getdents64(directory.get(), entries, sizeof entries)) > 0) {
+    for (ssize_t at = 0; at < bytes;) {
+      const auto* entry = reinterpret_cast<const dirent64*>(entries + at);
+      if (secondsInLogFileName(entry->d_name)) names.emplace_back(entry->d_name);
+      at += entry->d_reclen;
+    }
   }
-  closedir(listing);
   std::sort(names.begin(), names.end());
 
   const double now = platform::timevalToSeconds(_clock.now());
@@ -151,9 +158,9 @@ std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
     } else if (newest && newest->created) {
       const bool later = file.created && *file.created > *newest->created;
       remove(later ? *newest : file);
-      if (later) newest = file;
+      if (later) newest = std::move(file);
     } else {
-      newest = file;
+      newest = std::move(file);
     }
   }
   return newest;
