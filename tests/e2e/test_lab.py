@@ -1,10 +1,13 @@
-"""The lab without a daemon: unusual bodies, its page, refusals."""
+"""The lab without a daemon: unusual bodies, its page, refusals, uploads and datagrams."""
 import base64
 import gzip
+import hashlib
 import json
+import socket
+import struct
 import unittest
 
-from harness import Lab, storebag
+from harness import DEADLINE, Lab, storebag
 
 
 class LabAlone(unittest.TestCase):
@@ -41,3 +44,28 @@ class LabAlone(unittest.TestCase):
         self.assertNotIn("<script>", page)
         for body, status in ((gzip.compress(bytes(65 << 20)), 413), (b"no gzip", 400)):
             self.assertEqual(self.lab.request("POST", "/events", body, {"Content-Encoding": "gzip"})[0].status, status)
+
+    def test_uploads(self):
+        plain = bytes(65 << 20) + b"end"
+        packed = gzip.compress(plain, 1)
+        for body, problem in ((packed, ""), (b"", "empty"), (packed[:-1], "cut short"), (packed + b"x", "behind"),
+                              (plain, "no gzip")):
+            self.lab.request("POST", "/upload?uuid=a%20b", body, {"Content-Encoding": "gzip"})
+            line = self.lab.received("uploads")[-1]
+            self.assertEqual((line["bytes"], line["sha256"]), (len(body), hashlib.sha256(body).hexdigest()))
+            self.assertRegex(line.get("problem", ""), problem or "^$")
+
+    def test_datagrams(self):
+        with socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as client:
+            client.settimeout(DEADLINE)
+            good = [struct.pack(">2xB11xHHH40xHH", 1, 68 ^ 0xffff, 5, 1, event, 1) + b" a=b" for event in (1, 2)]
+            for wrong in (good[0] + b"x", good[0][:63], b""):
+                client.sendto(wrong, self.lab.dashboard)
+            for line, problem in zip(self.lab.received("dashboard", 3), ("says that it has", "shorter", "shorter")):
+                self.assertIn(problem, line["problem"])
+            self.lab.control(path="/dashboard", times=1, ack="reorder")
+            for packet in good:
+                client.sendto(packet, self.lab.dashboard)
+            answers = [client.recvfrom(4096) for _ in range(3)]
+        self.assertEqual({sender for _, sender in answers}, {self.lab.dashboard})
+        self.assertEqual([struct.unpack(">60xH2x", answer)[0] for answer, _ in answers], [1, 2, 1])
