@@ -103,7 +103,9 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
     countersFile.writeSoon();
     const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
     // Sessions may come and go between two ticks.
-    if (!idle || std::exchange(accepted, agent.acceptedSessions()) != accepted) {
+    const std::uint64_t acceptedNow = agent.acceptedSessions();
+    if (!idle || acceptedNow != accepted) {
+      accepted = acceptedNow;
       returns = kTicksToReturnMemory;
     } else if (returns > 0) {
       --returns;
