@@ -22,7 +22,7 @@ std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
 }
 
 void VeltraBackend::updateState() {
-  setState(kBackendReporting);
+  setState({kBackendReporting, wire::Reason::always});
 }
 
 std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
@@ -81,6 +81,17 @@ std::optional<double> VeltraBackend::samplingThreshold() const {
 void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
   const Lock held(_mutex);
   _samplingThreshold = value;
+}
+
+BackendActivity VeltraBackend::activity() const {
+  const Lock held(_mutex);
+  return {0, _postsUnderWay.load(std::memory_order_relaxed), _lastOutcome};
+}
+
+void VeltraBackend::postEnded(std::string outcome) {
+  _postsUnderWay.fetch_sub(1, std::memory_order_relaxed);
+  const Lock held(_mutex);
+  _lastOutcome.swap(outcome);
 }
 
 }  // namespace veltrad::backends

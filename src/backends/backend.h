@@ -16,6 +16,7 @@
 #include "base/value.h"
 #include "platform/clock.h"
 #include "wire/error.h"
+#include "wire/reasons.h"
 
 namespace veltrad::platform {
 class Counters;
@@ -30,6 +31,19 @@ enum BackendState : std::int32_t {
   kBackendDisabled = 1,
   kBackendReporting = 2,
   kBackendHeld = 3,  // sampled out, but held instead of disabled
+};
+
+// A state and why. Aligned so that the two change in one indivisible store.
+struct alignas(8) StateVerdict {
+  std::int32_t state = kBackendWaiting;
+  wire::Reason reason = wire::Reason::waits_for_user_info;
+};
+
+// What a back end has to do with its messages just now.
+struct BackendActivity {
+  std::size_t held = 0;      // events that wait for a flush, datagrams that wait for the socket
+  std::size_t underWay = 0;  // posts without an answer, datagrams without an acknowledgement
+  std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
 };
 
 // Who has a back end made.
@@ -85,12 +99,17 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::shared_ptr<const SessionFacts> facts() const;
   void setFacts(std::shared_ptr<const SessionFacts> facts);
   void setUserInfoDict(SharedDictionary userInfo);
-  std::int32_t state() const { return _state.load(std::memory_order_relaxed); }
-  void setState(std::int32_t value) { _state.store(value, std::memory_order_relaxed); }
+  std::int32_t state() const { return stateVerdict().state; }
+  StateVerdict stateVerdict() const { return _state.load(std::memory_order_relaxed); }
+  void setState(StateVerdict verdict) { _state.store(verdict, std::memory_order_relaxed); }
   std::int32_t hierarchy() const { return _hierarchy.load(std::memory_order_relaxed); }
   void setHierarchy(std::int32_t value) { _hierarchy.store(value, std::memory_order_relaxed); }
   std::optional<double> samplingThreshold() const;
   void setSamplingThreshold(std::optional<double> value);
+  virtual BackendActivity activity() const;
+  // A post begins; it ended so.
+  void postBegins() { _postsUnderWay.fetch_add(1, std::memory_order_relaxed); }
+  void postEnded(std::string outcome);
 
  protected:
   // Stores copies and draws the sampling factor. The kinds' initWithName(…) come here.
@@ -108,12 +127,14 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::uint16_t _eventID = 0;
 
   // Each indivisible on its own.
-  std::atomic<std::int32_t> _state{kBackendWaiting};
+  std::atomic<StateVerdict> _state{StateVerdict()};
+  std::atomic<std::uint32_t> _postsUnderWay{0};
   std::atomic<std::int32_t> _hierarchy{0};
 
   mutable Mutex _mutex BACKEND_LOCK;
   std::shared_ptr<const SessionFacts> _facts GUARDED_BY(_mutex) = std::make_shared<const SessionFacts>();
   std::optional<double> _samplingThreshold GUARDED_BY(_mutex);
+  std::string _lastOutcome GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::backends

@@ -45,6 +45,17 @@ void Families::userInfoUpdatedForSession(session::FamilyFacts facts) {
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
+Families::Parents Families::parents() {
+  Parents parents;
+  const Lock held(_lock);
+  for (const auto& [session, member] : _members) {
+    const FamilyMember* parent =
+        member.home->second.getFirstSessionWithHierarchy(std::int64_t{member.level} - 1);
+    if (parent) parents.emplace(session, parent->facts.aggregation.get());
+  }
+  return parents;
+}
+
 void Families::leave(const session::Aggregation& session) {
   Members::node_type left;
   const Lock held(_lock);

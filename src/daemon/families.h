@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <cstddef>
+#include <map>
 #include <memory_resource>
 #include <optional>
 #include <string>
@@ -29,6 +30,10 @@ class Families {
 
   bool ancestorAggregates(const session::FamilyPlace& place);
   session::CopySent sendToAncestor(const session::FamilyPlace& place, std::string_view copy);
+
+  // The parent of each session that has one.
+  using Parents = std::map<const session::Aggregation*, const session::Aggregation*>;
+  Parents parents();
 
   // Without a lock.
   std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }

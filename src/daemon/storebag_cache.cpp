@@ -61,6 +61,11 @@ std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clie
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
 }
 
+std::map<std::string, StorebagRecord> StorebagCache::records() {
+  const Lock held(_lock);
+  return _cachedStorebags;
+}
+
 void StorebagCache::settle(StorebagRecord& record) {
   record.beingFetched = false;
   _fetched.notifyAll();

@@ -51,6 +51,8 @@ class StorebagCache {
   // for the same name, without the lock.
   std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
+  // By name; a record being fetched is as its last attempt left it.
+  std::map<std::string, StorebagRecord> records();
 
  private:
   // Nobody fetches it any more.

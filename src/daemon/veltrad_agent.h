@@ -32,9 +32,11 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
       const session::VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const session::VeltradSession& session) override;
   void sessionInfoUpdated(session::FamilyFacts facts) override {
+    _sessionList.tell(facts);
     _families.sessionInfoUpdated(std::move(facts));
   }
   void userInfoUpdatedForSession(session::FamilyFacts facts) override {
+    _sessionList.tell(facts);
     _families.userInfoUpdatedForSession(std::move(facts));
   }
   void updateDownstreamSessions(session::FamilyFacts facts) override {
@@ -53,6 +55,11 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   // All that ever came. Without a lock.
   std::uint64_t acceptedSessions() const { return _sessionList.accepted(); }
   std::size_t userInfoKeyCount() const { return _families.userInfoKeyCount(); }
+
+  // For observers.
+  std::vector<ListedSession> sessions() const { return _sessionList.all(); }
+  Families::Parents parents() { return _families.parents(); }
+  StorebagCache& storebags() { return _cachedStorebags; }
 
  private:
   void sessionInvalidated(const std::shared_ptr<session::VeltradSession>& session);

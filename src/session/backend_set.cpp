@@ -75,10 +75,12 @@ void syncReportingStates(const BackendSet& backends, const BackendSet* parents) 
     if (backend->state() == backends::kBackendHeld) continue;
     const auto at = parents ? parents->find(name) : BackendSet::const_iterator();
     if (!parents || at == parents->end()) {
-      backend->setState(backends::kBackendDisabled);
+      backend->setState({backends::kBackendDisabled, wire::Reason::parent_has_none});
       continue;
     }
-    backend->setState(at->second->state());
+    backends::StateVerdict verdict = at->second->stateVerdict();
+    if (verdict.state == backends::kBackendDisabled) verdict.reason = wire::Reason::parent_state;
+    backend->setState(verdict);
     backend->setSamplingThreshold(at->second->samplingThreshold());
     logDebug("HTTPSPostBackend(syncReportingStates): %s: state and sampling rate updated to %d, %.02f%%",
              backend->name().c_str(), backend->state(), backend->samplingThreshold().value_or(0));

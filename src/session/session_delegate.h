@@ -15,7 +15,7 @@ namespace veltrad::session {
 
 class VeltradSession;
 
-// What a session tells its family of itself.
+// What a session tells of itself: its family, and those who look after the device.
 struct FamilyFacts {
   std::shared_ptr<Aggregation>
       aggregation;  // never null, and no other session's: the families know it by this
@@ -23,6 +23,7 @@ struct FamilyFacts {
   std::string sessionIDString;
   backends::SharedDictionary userInfo;         // null: none
   std::shared_ptr<const BackendSet> backends;  // null: none
+  backends::SharedDictionary sessionInfo;      // null: none
 };
 
 // Where a session is in its family, as it knows itself.

@@ -60,7 +60,7 @@ std::string VeltradSession::description() const {
 }
 
 FamilyFacts VeltradSession::familyFacts() const {
-  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends};
+  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends, _sessionInfo};
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {

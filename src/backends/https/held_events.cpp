@@ -10,9 +10,9 @@ HeldEvents::~HeldEvents() {
   _counters.count(wire::Reason::ended_before_flush, _batch.size());
 }
 
-bool HeldEvents::empty() const {
+std::size_t HeldEvents::size() const {
   const Lock held(_mutex);
-  return _batch.size() == 0;
+  return _batch.size();
 }
 
 HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,

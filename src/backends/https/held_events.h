@@ -37,7 +37,8 @@ class HeldEvents final : public platform::Evictable {
   // Counts what still waited: a second start, or user info that never came, lets the events go.
   ~HeldEvents() override;
 
-  bool empty() const;
+  std::size_t size() const;
+  bool empty() const { return size() == 0; }
   Need needOf(std::int32_t method, std::int32_t threshold, const EventSize& size) const;
   // How often the session ID has changed; add() with an older count gives the event the present one.
   std::uint64_t sessionIDChanges() const { return _sessionIDChanges.load(std::memory_order_acquire); }

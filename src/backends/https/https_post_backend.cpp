@@ -56,6 +56,12 @@ void HTTPSPostBackend::updateState() {
   setState(_clientState.updateBackendState());
 }
 
+BackendActivity HTTPSPostBackend::activity() const {
+  BackendActivity activity = VeltraBackend::activity();
+  activity.held = _held->size();
+  return activity;
+}
+
 std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
   if (state() == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
@@ -80,7 +86,9 @@ std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedM
   Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
   if (facts->userInfo) event.merge(*facts->userInfo);
   filterEvent(event);
-  if (meansSamplingOverride(message.flag) && state() == kBackendHeld) setState(kBackendReporting);
+  if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
+    setState({kBackendReporting, wire::Reason::reports});
+  }
   const bool realtime = meansRealtime(message.flag);
   logDebug("HTTPSPostBackend(sendMessage): realtime is %d", realtime ? 1 : 0);
 

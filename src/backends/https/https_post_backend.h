@@ -37,6 +37,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
+  BackendActivity activity() const override;
 
  private:
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,

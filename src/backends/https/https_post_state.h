@@ -35,8 +35,8 @@ class HTTPSPostState {
         _identity(identity),
         _links(identity.preferences) {}
 
-  // The state (BackendState) for the present user info.
-  std::int32_t updateBackendState();
+  // The state for the present user info.
+  StateVerdict updateBackendState();
 
   bool batchEvents(const SessionFacts& facts) const { return _batchEvents.value_or(facts.batchEvents); }
   const PostIdentity& identity() const { return _identity; }
@@ -47,8 +47,9 @@ class HTTPSPostState {
 
  private:
   void applyExpedite(const config::ClientEntry& entry);
-  std::int32_t reportForEveryone();
-  std::int32_t reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
+  StateVerdict counted(std::int32_t state, wire::Reason reason);
+  StateVerdict reportForEveryone();
+  StateVerdict reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
                                const std::optional<std::string>& serviceName);
   void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                   const std::optional<std::string>& country) const;

@@ -19,7 +19,8 @@ namespace {
 
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
-    "expected session, send, one-shot, states, display-url, upload, upload-log-data or stats";
+    "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status or "
+    "metrics";
 
 // As they stand on the command line, before they are put together.
 struct Texts {
@@ -183,10 +184,23 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
                              "Show the address at which a session's reports can be viewed");
   addIdentity(*url, options.identity, texts, false);
   url->footer("Example:\n  veltractl display-url --client-type 7");
+}
 
+// For those who look after a device.
+void addObservation(CLI::App& app, Options& options) {
+  const char* group = "Looking after a device";
+  CLI::App* status = addCommand(app, options, Command::status, "status",
+                                "Show the running daemon, its sessions, storebags and servers")
+                         ->group(group);
+  status->add_flag("--watch", options.watch, "Show it anew every second, until interrupted");
+  status->footer("Examples:\n  veltractl status --watch\n  veltractl status --json");
+  addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text")
+      ->group(group)
+      ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
-                               "Show what happened to messages, by reason, with counts");
-  stats->footer("Examples:\n  veltractl stats\n  veltractl --json stats");
+                               "Show what happened to messages, by reason, with counts")
+                        ->group(group);
+  stats->footer("Examples:\n  veltractl stats\n  veltractl stats --json");
 }
 
 void addUploads(CLI::App& app, Options& options, Texts& texts) {
@@ -216,7 +230,7 @@ void addGlobals(CLI::App& app, Options& options) {
       ->check(CLI::Validator(
           [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
           ""));
-  app.add_flag("--json", options.json, "Print stats as JSON; the other commands always print JSON");
+  app.add_flag("--json", options.json, "Print status and stats as JSON; what opens a session always does");
   app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
   app.set_help_flag("-h,--help", "Print this help");
   app.require_subcommand(1);
@@ -275,6 +289,7 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   addOneShot(app, options, texts);
   addQuestions(app, options, texts);
   addUploads(app, options, texts);
+  addObservation(app, options);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {

@@ -21,13 +21,24 @@ struct Identity {
   std::optional<Dictionary> userInfo;
 };
 
-enum class Command { session, send, oneShot, states, displayURL, upload, uploadLogData, stats };
+enum class Command {
+  session,
+  send,
+  oneShot,
+  states,
+  displayURL,
+  upload,
+  uploadLogData,
+  stats,
+  status,
+  metrics
+};
 
 struct Options {
   Command command = Command::session;
   std::optional<std::string> root;  // absent: VELTRA_ROOT, else "/"
   bool json = false;
-  Identity identity;                  // all but stats
+  Identity identity;                  // of what opens a session
   bool aggregate = false;             // session
   std::optional<std::string> input;   // session: a file; absent: standard input
   std::uint16_t category = 0;         // send, oneShot
@@ -35,6 +46,7 @@ struct Options {
   std::uint32_t flag = 0;             // send
   std::optional<Dictionary> payload;  // send, oneShot; absent without KEY=VALUE
   std::string file;                   // upload, uploadLogData
+  bool watch = false;                 // status
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line.
