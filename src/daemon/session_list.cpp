@@ -1,8 +1,5 @@
-// Sessions come and go.
+// Adds and removes sessions.
 #include "daemon/session_list.h"
-
-#include "platform/transaction.h"
-#include "session/veltrad_session.h"
 
 namespace veltrad::daemon {
 

@@ -1,4 +1,4 @@
-// The sessions that the daemon serves, and the transaction that is open while there are any. Any thread.
+// The sessions that the daemon serves. A transaction is open while there are any. Any thread.
 #pragma once
 
 #include <atomic>
@@ -7,14 +7,8 @@
 #include <vector>
 
 #include "daemon/lock_ranks.h"
-
-namespace veltrad::platform {
-class Transaction;
-}  // namespace veltrad::platform
-
-namespace veltrad::session {
-class VeltradSession;
-}  // namespace veltrad::session
+#include "platform/transaction.h"
+#include "session/veltrad_session.h"
 
 namespace veltrad::daemon {
 
@@ -26,15 +20,15 @@ class SessionList {
   void add(std::shared_ptr<session::VeltradSession> session);
   void remove(const std::shared_ptr<session::VeltradSession>& session);
 
-  // Without a lock.
   std::size_t size() const { return _size.load(std::memory_order_relaxed); }
-  // All that ever came.
+  // The number of sessions since the start.
   std::uint64_t accepted() const { return _accepted.load(std::memory_order_relaxed); }
 
  private:
   platform::Transaction& _transaction;
 
-  Mutex _lock SESSION_LIST_LOCK;  // opening and closing the transaction as well
+  // Also guards opening and closing the transaction.
+  Mutex _lock SESSION_LIST_LOCK;
   std::vector<std::shared_ptr<session::VeltradSession>> _sessions GUARDED_BY(_lock);
 
   std::atomic<std::size_t> _size{0};
