@@ -25,7 +25,6 @@ struct FamilyMember;
 // A member must leave before it is destroyed.
 class CorrelatedList {
  public:
-  // The member is in no list.
   void join(FamilyMember& member);
   void leave(const FamilyMember& member);
   void refreshLevel(FamilyMember& member);
@@ -46,7 +45,6 @@ class CorrelatedList {
   std::map<std::pair<std::int64_t, std::uint64_t>, const FamilyMember*> _members;
 };
 
-// By user-info key.
 using CorrelatedLists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;
 
 struct FamilyMember {

@@ -45,7 +45,6 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   std::string description() const override;
 
   std::size_t sessionCount() const { return _sessionList.size(); }
-  // The number of sessions since the start.
   std::uint64_t acceptedSessions() const { return _sessionList.accepted(); }
   std::size_t userInfoKeyCount() const { return _families.userInfoKeyCount(); }
 

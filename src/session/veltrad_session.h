@@ -105,7 +105,6 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSessionDelegate& _sessionDelegate;
   // Base64 of 16 random bytes.
   const std::string _sessionIDString;
-  // May be null.
   const std::shared_ptr<platform::MemoryAccount> _account;
   const std::shared_ptr<Aggregation> _aggregation;
 
@@ -114,7 +113,6 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // The line has been logged for the current user info.
   bool _saidWithoutUserInfo = false;
   std::uint32_t _sessionID = 0;
-  // These may be null.
   backends::SharedDictionary _sessionInfo;
   backends::SharedDictionary _userInfo;
   std::shared_ptr<const BackendSet> _backends;

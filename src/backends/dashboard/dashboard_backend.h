@@ -68,7 +68,6 @@ class DashboardBackend final : public VeltraBackend {
   platform::Counters& _counters;
   const bool _usingProfile;
   const std::optional<std::string> _postURL;
-  // Null until it is initialised.
   std::shared_ptr<NetworkProcQueue> _networkProcQueue;
 
   // The session's thread only.

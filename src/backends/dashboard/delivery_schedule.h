@@ -26,7 +26,6 @@ class DeliverySchedule {
   Verdict cleanup(bool waiting);
   // Cancels a clean-up, because something is sent again.
   void resume();
-  // Called at the end of every tick.
   Verdict afterTick(Time now, bool waiting);
 
  private:

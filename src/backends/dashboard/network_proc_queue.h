@@ -33,7 +33,6 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
  public:
   struct Kind {
     bool reliableUDP = false;
-    // By one-shot messages.
     bool shared = false;
     std::chrono::milliseconds period{};
   };

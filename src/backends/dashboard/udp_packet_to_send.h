@@ -20,7 +20,6 @@ struct UDPPacketToSend {
   State state = notSent;
   // Ticks since the last transmission.
   int numberOfChecks = 0;
-  // 0 to 4.
   int numberOfRetransmits = 0;
 };
 

@@ -18,7 +18,6 @@ struct ClientFacts {
   std::optional<std::string> country;
   std::string productFamily;
   std::optional<std::string> hardwareType;
-  // In [0, 1).
   double samplingFactor = 0;
 };
 

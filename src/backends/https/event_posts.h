@@ -25,10 +25,9 @@ class EventPosts {
     std::string json;
     std::optional<EventMap> eventMap;
     std::size_t eventCount = 0;
-    // Pays for the post and for `completionBytes`, which the completion keeps.
+    // Pays for the post and for `completionBytes`, which the completion (it may be empty) keeps.
     platform::Charge charge;
     std::size_t completionBytes = 0;
-    // May be empty.
     VeltraBackend::FlushCompletion completion;
   };
 

@@ -60,7 +60,6 @@ class ClientSession {
 
   Interrupt& _interrupt;
   const CopyHandler _aggregated;
-  // An event descriptor.
   const FileDescriptor _arrived;
   veltra_session* _session = nullptr;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};

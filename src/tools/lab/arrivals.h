@@ -23,7 +23,6 @@ struct Arrivals {
     const char* title;
     Received& lines;
   };
-  // In the order of the live page.
   std::array<Kind, 5> kinds() {
     return {{{"events", "Events", events},
              {"dashboard", "Dashboard datagrams", dashboard},

@@ -56,7 +56,6 @@ class Dashboard {
   FileDescriptor _socket;
   // On another port.
   FileDescriptor _stranger;
-  // An event descriptor.
   FileDescriptor _stopping;
   int _port = 0;
   std::thread _thread;

@@ -82,7 +82,6 @@ bool isBelow(std::string_view path, std::string_view top) {
   return path.starts_with(top) && (path.size() == top.size() || path[top.size()] == '/');
 }
 
-// The decoded parameters by name.
 Dictionary queryOf(const httplib::Request& request) {
   Dictionary query;
   for (const auto& [name, text] : request.params) query.set(toUTF8(name), toUTF8(text));
