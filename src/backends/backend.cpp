@@ -1,4 +1,4 @@
-// The base behaviour of every backend.
+// The default behaviour of back ends.
 #include "backends/backend.h"
 
 #include <openssl/evp.h>
@@ -7,7 +7,6 @@
 #include <utility>
 
 #include "base/text.h"
-#include "platform/random.h"
 
 namespace veltrad::backends {
 
@@ -49,12 +48,12 @@ bool VeltraBackend::uploadLogData(const Array&) {
   return false;
 }
 
-std::shared_ptr<const SessionFacts> VeltraBackend::facts() const {
+SharedFacts VeltraBackend::facts() const {
   const Lock held(_mutex);
   return _facts;
 }
 
-void VeltraBackend::setFacts(std::shared_ptr<const SessionFacts> facts) {
+void VeltraBackend::setFacts(SharedFacts facts) {
   const Lock held(_mutex);
   _facts.swap(facts);
 }

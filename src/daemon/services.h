@@ -1,4 +1,4 @@
-// The real services, built once by a program's main and handed on by reference, a few to each room.
+// The daemon's services, made once by main and passed to the rooms by reference.
 #pragma once
 
 #include "backends/ampery/energy_log.h"
@@ -22,6 +22,7 @@
 
 namespace veltrad::daemon {
 
+// Its 18 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),

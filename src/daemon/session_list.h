@@ -1,4 +1,4 @@
-// The sessions that the daemon serves, and the transaction that is open while there are any. Any thread.
+// The sessions that the daemon serves. A transaction is open while there are any. Any thread.
 #pragma once
 
 #include <atomic>
@@ -36,7 +36,7 @@ class SessionList {
   std::vector<ListedSession> all() const;
   // Without a lock.
   std::size_t size() const { return _size.load(std::memory_order_relaxed); }
-  // All that ever came.
+  // The number of sessions since the start.
   std::uint64_t accepted() const { return _accepted.load(std::memory_order_relaxed); }
 
  private:

@@ -1,13 +1,10 @@
-// When to download, and what a download leaves in the cache.
+// Decides when to download, and takes the result into the cache.
 #include "daemon/storebag_cache.h"
 
 #include <cmath>
 #include <new>
 
 #include "config/client_types.h"
-#include "config/storebag_content.h"
-#include "config/storebag_source.h"
-#include "platform/clock.h"
 #include "platform/log.h"
 
 namespace veltrad::daemon {

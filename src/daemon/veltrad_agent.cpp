@@ -1,4 +1,4 @@
-// Acceptance and invalidation of connections; which collection answers what.
+// Accepts and removes connections.
 #include "daemon/veltrad_agent.h"
 
 #include <fmt/format.h>

@@ -1,4 +1,4 @@
-// Events posted, and what becomes of them.
+// Posts events and handles the answers.
 #include "backends/https/event_posts.h"
 
 #include <fmt/format.h>
@@ -16,7 +16,7 @@ namespace {
 wire::Reason reasonOf(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
-    case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
+    case http::HTTPError::Kind::tooLarge:
       return wire::Reason::post_failed;
     case http::HTTPError::Kind::tooMany:
       return wire::Reason::too_many_posts;

@@ -1,7 +1,5 @@
-// The batch under its lock.
+// Guards the batch and keeps its charge up to date.
 #include "backends/https/held_events.h"
-
-#include "platform/counters.h"
 
 namespace veltrad::backends {
 
@@ -82,9 +80,9 @@ void HeldEvents::dropOldest() {
   _counters.count(wire::Reason::event_over_share);
 }
 
-// The charge follows the batch; how many events had to go because it could not grow.
+// Adjusts the charge to the batch. Returns how many events were dropped because the charge could not grow.
 std::size_t HeldEvents::settle() {
-  if (_charge.bytes() == 0) return 0;  // nobody pays
+  if (_charge.bytes() == 0) return 0;  // no account
   std::size_t dropped = 0;
   for (; !_charge.resize(_batch.chargedBytes()); ++dropped) _batch.dropOldest();
   return dropped;

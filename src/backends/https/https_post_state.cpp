@@ -1,4 +1,4 @@
-// Whether and how the back end reports for the current client.
+// Applies the decision on a client entry to the back end.
 #include "backends/https/https_post_state.h"
 
 #include <algorithm>
@@ -6,7 +6,6 @@
 #include "backends/https/text_lists.h"
 #include "formats/json.h"
 #include "platform/counters.h"
-#include "platform/locale.h"
 #include "platform/log.h"
 #include "wire/constants.h"
 
@@ -110,7 +109,7 @@ void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVe
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;
     default:
-      break;  // the line of the state says it
+      break;
   }
 }
 

@@ -13,15 +13,12 @@
 #include "backends/https/post_identity.h"
 #include "backends/https/post_links.h"
 #include "config/storebag_content.h"
-
-namespace veltrad::platform {
-class Locale;
-}  // namespace veltrad::platform
+#include "platform/locale.h"
 
 namespace veltrad::backends {
 
-// Part of its back end, which it reads the facts from, and tells hierarchy and sampling
-// threshold. What a run does not reach stays as an earlier one has left it.
+// Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. What an
+// update does not reach keeps its earlier value.
 class HTTPSPostState {
  public:
   // `profile` has "clients".
@@ -56,7 +53,6 @@ class HTTPSPostState {
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
   void resetBackendStateWithClient(const config::ClientEntry* entry);
 
-  // Constant after construction.
   VeltraBackend& _backEnd;
   const std::shared_ptr<const config::HTTPSPostProfile> _profile;
   platform::Locale& _locale;
@@ -65,7 +61,8 @@ class HTTPSPostState {
   PostIdentity _identity;
   PostLinks _links;
   FilterTable _filters;
-  std::optional<bool> _batchEvents;  // an entry's "expedite"
+  // From an entry's "expedite".
+  std::optional<bool> _batchEvents;
   std::int32_t _eventThreshold = 49;
   std::optional<double> _overrideSampling;
 };

@@ -1,4 +1,4 @@
-// veltractl: talks to veltrad through libveltra, as any client does. The main thread.
+// veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
 
 #include "tools/ctl/options.h"
