@@ -1,4 +1,4 @@
-// libsystemd's notifications and handed-over sockets. Any thread.
+// Notifications and socket activation with libsystemd.
 #include "platform/service_manager.h"
 
 #include <sys/socket.h>
@@ -19,8 +19,8 @@ void ServiceManager::stopping() {
 
 void ServiceManager::status(const std::string& text) {
   std::string assignment = "STATUS=" + text;
-  std::replace(assignment.begin(), assignment.end(), '\n',
-               ' ');  // a line break would begin another assignment
+  // A line break would begin another assignment.
+  std::replace(assignment.begin(), assignment.end(), '\n', ' ');
   ::sd_notify(0, assignment.c_str());
 }
 
@@ -35,7 +35,7 @@ std::optional<std::chrono::milliseconds> ServiceManager::watchdogInterval() cons
 }
 
 Result<std::optional<int>, std::string> ServiceManager::handedOverSocket() {
-  const int count = ::sd_listen_fds(1);  // takes the variables out of the environment; close-on-exec
+  const int count = ::sd_listen_fds(1);  // removes the variables from the environment; close-on-exec
   if (count < 0) return Failure{"the handed-over sockets: " + std::generic_category().message(-count)};
   if (count == 0) return std::optional<int>();
   if (count > 1) return Failure{"expected one handed-over socket, got " + std::to_string(count)};

@@ -1,4 +1,4 @@
-// The service manager, where there is one: readiness, status, watchdog, handed-over sockets. Any thread.
+// The service manager, if there is one: readiness, status, watchdog, socket activation.
 #pragma once
 
 #include <chrono>
@@ -11,15 +11,15 @@ namespace veltrad::platform {
 
 class ServiceManager {
  public:
-  // Without NOTIFY_SOCKET in the environment every notification does nothing.
+  // Without NOTIFY_SOCKET in the environment, notifications do nothing.
   void ready();
   void stopping();
   void status(const std::string& text);
   void feedWatchdog();
-  // Half of WATCHDOG_USEC; absent when no watchdog is wanted of this process.
+  // Half of WATCHDOG_USEC; absent if this process has no watchdog.
   std::optional<std::chrono::milliseconds> watchdogInterval() const;
-  // The one listening Unix stream socket that was handed over (socket activation), made close-on-exec, or
-  // nothing. More than one, or one of another kind, is an error that says what came.
+  // The socket of socket activation, made close-on-exec; absent if there is none. More than one, or one that
+  // is not a listening Unix stream socket, is an error.
   Result<std::optional<int>, std::string> handedOverSocket();
 };
 
