@@ -1,4 +1,4 @@
-// Lock, stale socket, bind, listen. One thread at a time.
+// Takes the lock, removes a stale socket and makes the listening one.
 #include "ipc/service_socket.h"
 
 #include <fcntl.h>
@@ -40,7 +40,7 @@ Result<FileDescriptor, std::string> takeLock(const std::string& path) {
                     "its own in VELTRA_ROOT.",
                     holderOf(lock.get()), path)};
   }
-  // Who holds it is for people; the lock holds without it.
+  // The process number is only for people.
   const std::string holder = fmt::format("{}\n", ::getpid());
   if (::ftruncate(lock.get(), 0) == 0) {
     [[maybe_unused]] const ssize_t written = ::pwrite(lock.get(), holder.data(), holder.size(), 0);
@@ -54,7 +54,7 @@ int socketOption(int socket, int option) {
   return ::getsockopt(socket, SOL_SOCKET, option, &value, &size) == 0 ? value : -1;
 }
 
-// Absent: usable.
+// Absent if it is usable.
 std::optional<std::string> faultOfHandedOver(int socket) {
   if (socketOption(socket, SO_DOMAIN) != AF_UNIX || socketOption(socket, SO_TYPE) != SOCK_STREAM) {
     return fmt::format("The descriptor {} that was handed over is no Unix stream socket.", socket);
@@ -66,7 +66,7 @@ std::optional<std::string> faultOfHandedOver(int socket) {
   return std::nullopt;
 }
 
-// Absent: nothing stands at the path any more. Only the holder of the lock calls it.
+// Absent if there is no file at the path any more. To be called by the holder of the lock.
 std::optional<std::string> removeStale(const std::string& path) {
   struct stat found {};
   if (::lstat(path.c_str(), &found) != 0) {
@@ -82,7 +82,7 @@ std::optional<std::string> removeStale(const std::string& path) {
   return std::nullopt;
 }
 
-// The socket's own status is of no use: it has an inode of another file system.
+// `made` gets the status of the file; fstat on the socket would show an inode of another file system.
 Result<FileDescriptor, std::string> listenAt(const std::string& path, struct stat& made) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -98,7 +98,7 @@ Result<FileDescriptor, std::string> listenAt(const std::string& path, struct sta
   if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     return Failure{fmt::format("The socket {} cannot be made: {}.", path, reason(errno))};
   }
-  // The entitlement decides who may use it, not the file mode.
+  // Access is decided by the entitlement, not by the file's mode.
   if (::lstat(path.c_str(), &made) != 0 || ::chmod(path.c_str(), 0666) != 0 ||
       ::listen(socket.get(), kWaitingConnections) != 0) {
     const int error = errno;
