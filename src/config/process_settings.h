@@ -1,4 +1,4 @@
-// The settings that hold for the life of the process. Any thread.
+// Settings that are constant for the life of the process. Any thread may ask.
 #pragma once
 
 #include <cstdint>
@@ -18,24 +18,23 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
-// Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
-// the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
-// `main` owns the one object of the process. What the constructor takes must outlive it.
+// Each setting is computed at its first call and kept: a preference that changes later takes effect at the
+// next start. During a shortage a setting is absent, and a later call computes it. What the constructor takes
+// must outlive it.
 class ProcessSettings {
  public:
-  // `deploymentPath`: a property list with the texts "internalStorebagHost" and "publicStorebagHost", each a
-  // host name with an optional port; example hosts stand in for what is missing.
+  // `deploymentPath` is a property list with the texts "internalStorebagHost" and "publicStorebagHost", each
+  // a host name with an optional port. Built-in hosts replace missing ones.
   ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
                   platform::FileStore& files, std::string deploymentPath);
 
   // 0 to 4; 0 names no section of a storebag.
   std::optional<std::uint32_t> currentEnvironment();
-  // No slash at its end, unless the preference has one.
+  // Without a slash at the end, unless the preference has one.
   std::optional<std::string> storebagServerURL();
-  bool isInternalBuild();
 
  private:
-  // The type, and the one that was refused for it.
+  // The type, and the invalid one that it replaces.
   struct Environment {
     std::uint32_t type;
     std::optional<std::uint32_t> refused;
@@ -50,7 +49,7 @@ class ProcessSettings {
   platform::FileStore& _files;
   const std::string _deploymentPath;
 
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // what was computed first is kept
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<std::uint32_t> _environment GUARDED_BY(_mutex);
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
 };

@@ -1,4 +1,4 @@
-// Picks from a client type's storebag the section of the process's environment. The caller's thread.
+// Downloads the storebag of a client type and selects the section of the process's environment.
 #pragma once
 
 #include "config/storebag_download.h"
@@ -6,8 +6,8 @@
 
 namespace veltrad::config {
 
-// The real source: downloads the storebag at each call. Keeps no state; any number of threads at once. What
-// the constructor takes must outlive it.
+// Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
+// it.
 class StorebagSections final : public StorebagSource {
  public:
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);

@@ -1,4 +1,4 @@
-// Keys that sign storebags. Any thread.
+// Keys that sign storebags, with OpenSSL.
 #include "config/storebag_signing.h"
 
 #include <openssl/bio.h>
@@ -33,7 +33,7 @@ std::string contentsOf(BIO* memory) {
   return std::string(bytes, static_cast<std::size_t>(length));
 }
 
-// Never asks for a passphrase on the terminal: an encrypted key is refused.
+// Refuses encrypted keys instead of asking for a passphrase on the terminal.
 int noPassphrase(char*, int, int, void*) {
   return -1;
 }

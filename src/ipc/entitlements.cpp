@@ -1,4 +1,4 @@
-// The rules of who may do what. Any thread; the file is reread when it changed.
+// Reads the entitlement rules and applies them to peers.
 #include "ipc/entitlements.h"
 
 #include <algorithm>
@@ -12,7 +12,7 @@ namespace veltrad::ipc {
 
 namespace {
 
-// An id exactly: no boolean, no real, nothing that would have to be wrapped.
+// Only an integer within the range of IDs.
 std::optional<unsigned> idOf(const Value& value) {
   if (value.type() != Value::Type::signedInteger && value.type() != Value::Type::unsignedInteger)
     return std::nullopt;
@@ -21,7 +21,7 @@ std::optional<unsigned> idOf(const Value& value) {
   return static_cast<unsigned>(*number);
 }
 
-// A condition of the wrong type is never met: read as absent, it would make the rule wider.
+// A condition of the wrong type never matches: ignoring it would make the rule grant more.
 bool matches(const Dictionary& rule, const Peer& peer) {
   const Value* uid = rule.find("uid");
   const Value* gid = rule.find("gid");
@@ -39,7 +39,7 @@ bool matches(const Dictionary& rule, const Peer& peer) {
   return true;
 }
 
-// Why the rule can never grant anything; nothing when it can.
+// Says why the rule can never grant anything; absent if it can.
 std::optional<std::string> problemOf(const Value& value) {
   const Dictionary* rule = value.asDictionary();
   if (!rule) return "expected a dictionary";
@@ -54,49 +54,47 @@ std::optional<std::string> problemOf(const Value& value) {
   return std::nullopt;
 }
 
-struct ReadRules {
-  Array rules;
-  std::optional<std::string> shortage;
+}  // namespace
+
+// Log lines, written after the lock was released.
+struct Entitlements::Said {
   std::optional<std::string> error;
+  std::optional<std::string> shortage;
   std::vector<std::string> warnings;
 };
 
-ReadRules readRules(platform::FileStore& files, const std::string& path) {
-  ReadRules read;
-  const auto bytes = files.read(path);
+Array Entitlements::readRules(Said& said) {
+  const auto bytes = _files.read(_path);
   if (!bytes) {
     const platform::FileFailure& failure = bytes.error();
     if (failure.passes()) {
-      read.shortage = failure.description;
+      said.shortage = failure.description;
     } else if (failure.kind != platform::FileFailure::Kind::notFound) {
-      read.error = failure.description;
+      said.error = failure.description;
     }
-    return read;
+    return {};
   }
   const auto list = formats::parsePropertyList(bytes.value());
   const Array* rules = list ? list.value().asArray() : nullptr;
   if (!rules) {
-    read.error = path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
-    return read;
+    said.error = _path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
+    return {};
   }
-  read.rules = *rules;
   bool namesUnits = false;
   for (std::size_t i = 0; i < rules->size(); ++i) {
     const Value& rule = (*rules)[i];
     if (const auto problem = problemOf(rule)) {
-      read.warnings.push_back(path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
+      said.warnings.push_back(_path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
     } else {
       namesUnits = namesUnits || rule.asDictionary()->contains("unit");
     }
   }
   if (namesUnits && !kernelTellsUnits()) {
-    read.warnings.push_back(path +
+    said.warnings.push_back(_path +
                             ": rules with \"unit\" never match, this kernel does not tell a peer's process");
   }
-  return read;
+  return *rules;
 }
-
-}  // namespace
 
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer) {
   for (const Value& value : rules) {
@@ -121,27 +119,17 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
 Entitlements::Entitlements(platform::FileStore& files, std::string path)
     : _files(files), _path(std::move(path)) {}
 
-// Logged once the lock is released.
-struct Entitlements::Said {
-  std::optional<std::string> error;
-  std::optional<std::string> shortage;
-  std::vector<std::string> warnings;
-};
-
 void Entitlements::refresh(Said& said) {
-  // The stamp comes first: a file that changes while it is read is read again.
+  // The stamp comes first, so that a file that changes while it is read is read again.
   const auto stamp = _files.stamp(_path);
   if (!stamp) {
     said.shortage = stamp.error().description;
     return;
   }
   if (_read && stamp.value() == _stamp) return;
-  ReadRules fresh = readRules(_files, _path);
-  said.shortage = std::move(fresh.shortage);
+  Array rules = readRules(said);
   if (said.shortage) return;
-  _rules = std::move(fresh.rules);
-  said.error = std::move(fresh.error);
-  said.warnings = std::move(fresh.warnings);
+  _rules = std::move(rules);
   _stamp = stamp.value();
   _read = true;
 }

@@ -1,4 +1,4 @@
-// Who may do what: etc/veltrad/entitlements.plist, reread when it changed. Any thread.
+// Entitlements of peers by etc/veltrad/entitlements.plist, which is read again when it changes. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -17,20 +17,20 @@ class FileStore;
 
 namespace veltrad::ipc {
 
-// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
-// rule with more than one of the three matches when all of them match, one with none never. A missing or
-// unreadable file grants nothing; an unreadable or malformed one is one error line a change. For a shortage
-// the last rules stand, and the file is read again at the next question.
+// The file is an array of rules, {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}. A rule
+// matches if all of its conditions match and there is at least one. A missing, unreadable or malformed file
+// grants nothing; the latter two are one error line for each change. During a shortage the last rules apply.
 class Entitlements {
  public:
   Entitlements(platform::FileStore& files, std::string path);
-  // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
+  // The value in the first rule that matches and names the entitlement. The caller checks that it is true.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
-  // False: no rule grants it to this user, whatever groups and unit a process of his has.
+  // False if no rule can grant it to this user, whatever the groups and the unit of the process.
   bool mayHold(std::string_view name, unsigned uid);
 
  private:
   struct Said;
+  Array readRules(Said& said);
   void refresh(Said& said) REQUIRES(_mutex);
   void say(const Said& said);
 
@@ -43,7 +43,7 @@ class Entitlements {
   platform::LimitedLine _shortages{"questions"};
 };
 
-// The decisions alone; exposed for their tables of tests.
+// The decisions, exposed for tests.
 bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid);
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
 

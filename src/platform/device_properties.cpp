@@ -1,4 +1,4 @@
-// The configured property list first, then the machine. Any thread; files are read at each question.
+// Device properties from device.plist, else from the machine.
 #include "platform/device_properties.h"
 
 #include "formats/property_list.h"
@@ -10,7 +10,7 @@ namespace veltrad::platform {
 
 namespace {
 
-// No machine says "ReleaseType".
+// No machine states "ReleaseType".
 std::optional<std::string> factOf(MachineFacts& machine, std::string_view key) {
   if (key == "ProductVersion") return machine.productVersion();
   if (key == "BuildVersion") return machine.buildVersion();
@@ -29,7 +29,7 @@ MachineProperties::MachineProperties(FileStore& files, std::string devicePropert
 
 DeviceProperty MachineProperties::value(std::string_view key) {
   const auto list = configured();
-  // The machine is not asked instead: it may say something else.
+  // The machine's value does not stand in: it may differ.
   if (!list) return Failure{list.error()};
   const std::string* text = list.value().string(key);
   if (!text) return fromMachine(key);
@@ -61,9 +61,9 @@ Result<Dictionary, FileFailure> MachineProperties::readList() {
 
 void MachineProperties::complainOnce(const std::string& why) {
   const auto stamp = _files.stamp(_path);
-  if (!stamp) return;  // the next question says it
+  if (!stamp) return;  // the next call logs it
   {
-    Lock lock(_mutex);
+    const Lock lock(_mutex);
     if (_hasComplained && _complained == stamp.value()) return;
     _hasComplained = true;
     _complained = stamp.value();

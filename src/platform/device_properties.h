@@ -1,4 +1,4 @@
-// The device property service: facts about this device by key. Any thread.
+// The device property service: facts about this device by key. Any thread may ask.
 #pragma once
 
 #include <cstdint>
@@ -13,8 +13,8 @@
 
 namespace veltrad::platform {
 
-// Nothing where there is no value. A failure is a shortage: for now nobody can say, and it is no answer that
-// may be remembered.
+// Absent if there is no value. A failure is a shortage: the value cannot be determined now, and the failure
+// must not be cached.
 using DeviceProperty = Result<std::optional<std::string>, FileFailure>;
 
 class DeviceProperties {
@@ -25,11 +25,11 @@ class DeviceProperties {
   virtual DeviceProperty value(std::string_view key) = 0;
 };
 
-// device.plist first (an empty text there: no value, and the machine is not asked), then what the machine
-// says: os-release, DMI or device tree, chassis. "UniqueDeviceID" is 40 hexadecimal digits derived one-way
-// from the machine id. The machine's files are always the host's, not under the root. An unreadable or
-// malformed device.plist is one error line a change, and as if it were not there. Files are read at each
-// question; one that cannot be read for a shortage is as it was when it last could be.
+// Takes a property from device.plist (an empty text there means no value), else from the machine: os-release,
+// DMI or device tree, chassis. "UniqueDeviceID" is 40 hexadecimal digits derived one-way from the machine id.
+// The machine's files are the host's, not those under the root. An unreadable or malformed device.plist
+// counts as missing, with one error line for each change of the file. Files are read at each call; during a
+// shortage, the last content that was read is used.
 class MachineProperties final : public DeviceProperties {
  public:
   MachineProperties(FileStore& files, std::string devicePropertyListPath);
@@ -44,10 +44,10 @@ class MachineProperties final : public DeviceProperties {
   FileStore& _files;
   const std::string _path;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  // As last read; what stands in during a shortage.
+  // The last content and facts read, for use during a shortage.
   std::optional<Dictionary> _lastList GUARDED_BY(_mutex);
   std::map<std::string, std::optional<std::string>, std::less<>> _lastFacts GUARDED_BY(_mutex);
-  // Of the file that the last error line was about.
+  // The stamp of the file that the last error line was about.
   FileStamp _complained GUARDED_BY(_mutex);
   bool _hasComplained GUARDED_BY(_mutex) = false;
 };
