@@ -120,25 +120,17 @@ class Family(HTTPSTest):
             daemon.wait_for_line(f"syncReportingStates: child session {child.number} (backend httppost) with hierarchy 1 is "
                                  "missing its parent")
 
-    # Entries of parent and child, status of the parent's collector, whether the child reports.
-    OUT, HELD = {"sampling_threshold": 0, "override_sampling": 0}, {"sampling_threshold": 0}
-    STATES = [({}, {}, 200, True), (OUT, {}, 200, False), (HELD, {}, 200, True), ({}, OUT, 200, True),
-              (OUT, HELD, 200, True), ({}, {}, 503, False)]
-
     def test_states_come_from_the_parent(self):
-        def entries(level, which):
-            return [entry(f"case{number}", hierarchy=level, **case[which]) for number, case in enumerate(self.STATES)]
-        self.bag(ROOT, *entries(0, 0))
-        self.bag(CHILD, *entries(1, 1), httppost2={"clients": [entry(client=None, hierarchy=1)]})  # not the parent's
+        """Of a back end of the same name; every combination is in tests/daemon/families_test.cpp."""
+        out = {"sampling_threshold": 0, "override_sampling": 0}
+        self.bag(ROOT, *(entry(name, hierarchy=0, **more) for name, more in (("in", {}), ("out", out), ("broken", {}))))
+        self.bag(CHILD, *(entry(name, hierarchy=1, **more) for name, more in (("in", out), ("out", {}), ("broken", {}))),
+                 httppost2={"clients": [entry(client=None, hierarchy=1)]})
+        self.lab.control(path="/events/broken", status=503)
         with self.serving() as daemon:
-            for number, (*_, status, reports) in enumerate(self.STATES):
-                with self.subTest(number):
-                    self.lab.control(path=f"/events/case{number}", status=status)
-                    root = self.join(ROOT, name=f"case{number}", batch=True)
-                    if status == 503:
-                        self.assertEqual(root.flush()[1], 503)
-                    child = self.join(CHILD, name=f"case{number}")
-                    self.assertEqual(child.backends, ["httppost"] * reports)
+            for name, code, backends in (("in", None, ["httppost"]), ("out", -1, []), ("broken", 503, [])):
+                self.assertEqual(self.join(ROOT, name=name, batch=True).flush()[1], code)
+                self.assertEqual(self.join(CHILD, name=name).backends, backends)
             daemon.wait_for_line("<7>HTTPSPostBackend(syncReportingStates): httppost: state and sampling rate updated to 1")
 
     def test_a_client_that_does_not_read_delays_nobody(self):
