@@ -34,6 +34,7 @@ TEST(CallTable, EndsEachCallOnceAndWhereItIsAwaited) {
   const auto callback = [](void*, const veltra_reply*) {};
   client::Waiter waiter, left;
   CallTable calls;
+  EXPECT_FALSE(CallTable::Call{}.awaitsAnswer());
   calls.add(1, {&waiter, nullptr, nullptr, nullptr});
   calls.add(2, {nullptr, callback, nullptr, nullptr});
   calls.add(3, {nullptr, nullptr, nullptr, file});

@@ -3,11 +3,12 @@ import concurrent.futures
 import re
 import time
 
-from harness import storebag, wait_until
+from harness import Wire, storebag, wait_until
 from test_https import Client, HTTPSTest, entry
 
 ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
 BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
+UPLOAD = "uploadFileAtPath:extensionToken:completionHandler:"
 DESCRIBE = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 PROXY = "<3>sendMessageWithDictionary: Failed to get remote object proxy: "
 END = {"timestamp": 0.0, "category": 0, "type": 0}
@@ -161,3 +162,19 @@ class Family(HTTPSTest):
         # The lines account for every lost copy, including the last two at the end of the session.
         said = [int(re.search(r"(?:\((\d+) copies since the last such line\))?$", line)[1] or 1) for line in lines]
         self.assertEqual(sum(said), sent - len(numbers) + counts["event dropped: the client has gone"])
+
+    def test_the_removal_of_an_uploaded_file_finds_room_where_copies_do_not(self):
+        self.bag(ROOT, entry(hierarchy=0), uploadserver={"post_url": "${url}/upload"})
+        self.lab.control(path="/upload", stall=True)
+        with self.serving(PROXY), open(self.root.path / "file", "w+b") as file:
+            file.write(b"lent")
+            file.flush()
+            root, child = self.join(ROOT, aggregates=True), self.join(CHILD)
+            root.send(Wire.CALL, {"op": UPLOAD, "args": {"path": "/lent"}}, 777, 1, [file.fileno()])
+            self.lab.received("uploads", 1)
+            for length in (*[1000] * 1300, *range(1000, -1, -1)):  # until none of any size is taken
+                child.message(text="x" * length)
+            self.lab.reset()
+            self.assertEqual(root.frame()[1:], (777, {"results": {"uploaded": True}}))
+            self.assertIn({"call": 777}, root.copies)
+        self.assertGreater(self.counts()["event dropped: the client does not read"], 1000)
