@@ -18,6 +18,8 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
+constexpr std::uint32_t kSeedEnvironment = 3;  // of ProcessSettings::currentEnvironment
+
 // Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
 // the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
 // `main` owns the one object of the process. What the constructor takes must outlive it.

@@ -3,8 +3,7 @@
 
 #include <fmt/format.h>
 
-#include <cmath>
-
+#include "backends/https/json_message.h"
 #include "config/client_types.h"
 
 namespace veltrad::backends {
@@ -21,10 +20,6 @@ bool reportsNumericSessionID(bool isInternal, std::int32_t compType) {
 std::int32_t coarsenedStart(double startTimeStamp) {
   const auto start = static_cast<std::int32_t>(static_cast<std::int64_t>(startTimeStamp));
   return start / 60 * 60;
-}
-
-double finiteOrMinusOne(double seconds) {
-  return std::isfinite(seconds) ? seconds : -1.0;
 }
 }  // namespace
 

@@ -48,11 +48,11 @@ std::string printed(const Value& value) {
   return excerpt.leftOut == 0 ? excerpt.text
                               : fmt::format("{}… ({} bytes cut)", excerpt.text, excerpt.leftOut);
 }
+}  // namespace
 
 double finiteOrMinusOne(double seconds) {
   return std::isfinite(seconds) ? seconds : -1.0;
 }
-}  // namespace
 
 std::size_t restrictEventForJSON(Dictionary& event) {
   std::vector<Dictionary::Entry> changed;

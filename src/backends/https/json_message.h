@@ -14,6 +14,9 @@ namespace veltrad::backends {
 // warning line. Returns how many entries were removed.
 std::size_t restrictEventForJSON(Dictionary& event);
 
+// -1.0 in place of what JSON cannot express.
+double finiteOrMinusOne(double seconds);
+
 struct JSONMessage {
   std::string compact;
   std::optional<std::string> pretty;  // only where it was wanted

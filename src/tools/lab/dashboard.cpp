@@ -11,6 +11,7 @@
 #include <cstring>
 
 #include "dashboard_packet.h"
+#include "platform/clock.h"
 
 namespace veltrad::lab {
 namespace {
@@ -24,10 +25,6 @@ constexpr std::size_t kLongBytes = 2000;
 constexpr std::uint16_t kForeignOffset = 0x4000;
 // How long one that is to be overtaken waits for another.
 constexpr std::chrono::milliseconds kLongestHold{1000};
-
-double now() {
-  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
 
 FileDescriptor boundSocket(int port, int& boundPort) {
   FileDescriptor made(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
@@ -137,7 +134,7 @@ void Dashboard::receive() {
 void Dashboard::handle(const sockaddr_in& from, std::string_view datagram) {
   const Rule rule = _misbehaviour.take(kDashboardPath).value_or(Rule());
   Dictionary line = fieldsOfPacket(datagram);
-  line.set("time", now());
+  line.set("time", platform::timevalToSeconds(platform::SystemClock().now()));
   line.set("from", textOf(from));
   line.set("bytes", std::uint64_t{datagram.size()});
   line.set("outcome", outcomeOf(datagram, rule));

@@ -12,6 +12,7 @@
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "page.h"
+#include "platform/clock.h"
 #include "upload_digest.h"
 
 namespace veltrad::lab {
@@ -24,10 +25,6 @@ constexpr std::size_t kThreads = 64;  // each open connection holds one
 constexpr std::size_t kPieceBytes = 64u << 10;
 constexpr std::chrono::milliseconds kLongestWait{60'000};
 constexpr const char* kPlainText = "text/plain; charset=utf-8";
-
-double now() {
-  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
 
 // Without those that the library adds for itself.
 Dictionary headersOf(const httplib::Request& request) {
@@ -42,7 +39,7 @@ Dictionary headersOf(const httplib::Request& request) {
 }
 
 Dictionary arrival(const httplib::Request& request) {
-  return {{"time", now()},
+  return {{"time", platform::timevalToSeconds(platform::SystemClock().now())},
           {"path", toUTF8(request.target)},
           {"method", request.method},
           {"headers", headersOf(request)}};
