@@ -1,7 +1,6 @@
 """Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
 place; the exit status is 1 if there is any."""
 import concurrent.futures
-import json
 import os
 import re
 import subprocess
@@ -82,53 +81,40 @@ def git(*arguments):
 
 def changed_files():
     """What differs from the commit where this branch left origin/main or, on main itself and without a remote, from the
-    commit before this one. Without such a commit: all files."""
+    commit before this one. None: there is no such commit."""
     base = git("merge-base", "HEAD", "origin/main")
     if not base or base == git("rev-parse", "HEAD"):
         base = git("rev-parse", "--verify", "HEAD~1")
     if not base:
-        return set(git("ls-files"))
+        return None
     return set(git("diff", "--name-only", *base) + git("ls-files", "--others", "--exclude-standard"))
-
-
-def lint_units():
-    """The translation units of the lint preset: each with the bodies that it joins."""
-    configure("lint")
-    units = {}
-    for entry in json.loads((ROOT / "build/lint/compile_commands.json").read_text()):
-        unit = Path(entry["file"])
-        joined = [Path(name) for name in re.findall(r'^#include "(/.*)"$', unit.read_text(), re.M)]
-        bodies = [path.relative_to(ROOT) for path in joined or [unit] if path.is_relative_to(ROOT / "src")]
-        if bodies:
-            units[unit] = bodies
-    return units
 
 
 def body_for(header, bodies):
     """A body that includes the header, its own one if there is one."""
     includes = re.compile(rf'#include ["<](.*/)?{re.escape(header.name)}[">]')
     for body in sorted(bodies, key=lambda path: (path.stem != header.stem, path)):
-        if includes.search((ROOT / body).read_text()):
+        if includes.search(body.read_text()):
             return body
     return None
 
 
-def lint(unit):
-    done = subprocess.run(["clang-tidy", "--quiet", "-p", "build/lint", str(unit)], cwd=ROOT, capture_output=True, text=True)
+def lint(body):
+    done = subprocess.run(["clang-tidy", "--quiet", "-p", "build/lint", str(body)], cwd=ROOT, capture_output=True, text=True)
     found = [line for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
-    return found or ([] if done.returncode == 0 else [f"{unit}: clang-tidy failed: {done.stderr.strip()}"])
+    return found or ([] if done.returncode == 0 else [f"{body}: clang-tidy failed: {done.stderr.strip()}"])
 
 
 def check_lint(changed=None):
-    """Lints all units, or those that have a changed body or a body that includes a changed header."""
-    units = lint_units()
+    """Lints the bodies that changed and, for each header that changed, one that includes it. None: all bodies."""
+    configure("lint")
+    bodies = {path for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"}
     if changed is not None:
-        bodies = {body for joined in units.values() for body in joined}
-        files = {Path(name) for name in changed if name.startswith(("src/", "include/"))}
-        wanted = {body_for(path, bodies) if path.suffix == ".h" else path for path in files}
-        units = [unit for unit, joined in units.items() if wanted & set(joined)]
+        files = {ROOT / name for name in changed if name.startswith(("src/", "include/"))}
+        headers = {path for path in files if path.suffix in (".h", ".hpp") and path.exists()}
+        bodies = bodies & (files | {body_for(path, bodies) for path in headers})
     with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
-        return sorted({line.replace(f"{ROOT}/", "") for found in pool.map(lint, units) for line in found})
+        return sorted({line.replace(f"{ROOT}/", "") for found in pool.map(lint, sorted(bodies)) for line in found})
 
 
 def main():
