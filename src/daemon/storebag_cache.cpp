@@ -1,13 +1,10 @@
-// When to download, and what a download leaves in the cache.
+// Decides when to download, and takes the result into the cache.
 #include "daemon/storebag_cache.h"
 
 #include <cmath>
 #include <new>
 
 #include "config/client_types.h"
-#include "config/storebag_content.h"
-#include "config/storebag_source.h"
-#include "platform/clock.h"
 #include "platform/log.h"
 
 namespace veltrad::daemon {
@@ -59,6 +56,11 @@ std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clie
   const Lock held(_lock);
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
+}
+
+std::map<std::string, StorebagRecord> StorebagCache::records() {
+  const Lock held(_lock);
+  return _cachedStorebags;
 }
 
 void StorebagCache::settle(StorebagRecord& record) {
