@@ -32,7 +32,7 @@ ConnectFailure noDaemon(std::string text) {
   return {VELTRA_NO_DAEMON, std::move(text)};
 }
 
-const char* kindOfFile(mode_t mode) {
+const char* kindOfNonSocket(mode_t mode) {
   if (S_ISDIR(mode)) return "a directory";
   if (S_ISREG(mode)) return "a regular file";
   return "no socket";
@@ -50,7 +50,7 @@ ConnectFailure refusedConnection(const std::string& shown, const std::string& pa
     return noDaemon(
         fmt::format("{} is {}, not the daemon's socket: remove it and start veltrad, or name another "
                     "root with VELTRA_ROOT or --root.",
-                    shown, kindOfFile(facts.st_mode)));
+                    shown, kindOfNonSocket(facts.st_mode)));
   }
   return noDaemon(fmt::format("The daemon that made {} has ended: start veltrad again.", shown));
 }

@@ -15,7 +15,6 @@ namespace {
 
 constexpr std::uint32_t kEnvironmentCount = 5;
 constexpr std::uint32_t kInternalEnvironment = 2;
-constexpr std::uint32_t kSeedEnvironment = 3;
 
 constexpr const char* kInternalStorebagHost = "storebags.internal.example";
 constexpr const char* kPublicStorebagHost = "storebags.example";

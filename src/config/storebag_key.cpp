@@ -21,7 +21,7 @@ struct Deleter {
 };
 using LibraryContext = std::unique_ptr<OSSL_LIB_CTX, Deleter<OSSL_LIB_CTX_free>>;
 using Provider = std::unique_ptr<OSSL_PROVIDER, Deleter<OSSL_PROVIDER_unload>>;
-using Key = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
+using PublicKey = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
 using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
 using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
 using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
@@ -37,14 +37,14 @@ class ErrorQueueAsItWas {
   ~ErrorQueueAsItWas() { ERR_pop_to_mark(); }
 };
 
-Key decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
+PublicKey decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
   EVP_PKEY* key = nullptr;
   const Decoder decoder(
       OSSL_DECODER_CTX_new_for_pkey(&key, "DER", structure, "RSA", EVP_PKEY_PUBLIC_KEY, library, nullptr));
   const unsigned char* at = bytesOf(der);
   std::size_t left = der.size();
   const bool decoded = decoder != nullptr && OSSL_DECODER_from_data(decoder.get(), &at, &left) == 1;
-  Key held(key);
+  PublicKey held(key);
   return decoded && left == 0 ? std::move(held) : nullptr;
 }
 
@@ -65,7 +65,7 @@ bool isUsable(const EVP_PKEY* key) {
 struct StorebagKey::Held {
   LibraryContext library;
   Provider provider;
-  Key key;
+  PublicKey key;
 };
 
 std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {

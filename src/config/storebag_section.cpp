@@ -11,7 +11,6 @@
 namespace veltrad::config {
 namespace {
 
-constexpr std::uint32_t kSeedEnvironment = 3;
 constexpr std::uint32_t kReleaseEnvironment = 4;
 
 // The section of an environment; null if there is none.

@@ -8,7 +8,7 @@
 namespace veltrad::platform {
 
 namespace {
-constexpr std::size_t kMostBytes = 4096;
+constexpr std::size_t kMostRequestBytes = 4096;
 }
 
 CountersFile::CountersFile(Counters& counters, FileStore& files, DiskWriter& writer, std::string path,
@@ -18,7 +18,7 @@ CountersFile::CountersFile(Counters& counters, FileStore& files, DiskWriter& wri
       _writer(writer),
       _path(std::move(path)),
       _startedAt(startedAt),
-      _queue(writer, kMostBytes) {}
+      _queue(writer, kMostRequestBytes) {}
 
 bool CountersFile::writeSoon() {
   if (!_counters.changed() || _asked.exchange(true)) return true;
