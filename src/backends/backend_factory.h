@@ -59,6 +59,8 @@ class BackendFactory {
                                                     const SharedFacts& facts, bool oneShot = false);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest() { _posts.sayRest(); }
+  // Frees memory that is kept for the next message. Called when nothing was sent for a while.
+  void rest() { _posts.rest(); }
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,

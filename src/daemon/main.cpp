@@ -100,8 +100,9 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-void serve(daemon::Services& services, daemon::VeltradAgent& agent, ipc::Listener& listener,
+void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
            platform::CountersFile& countersFile, daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+  daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
   // The last threads may still be ending.
@@ -121,6 +122,7 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, ipc::Listene
       returns = kTicksToReturnMemory;
     } else if (returns > 0) {
       --returns;
+      daemon.backends().rest();
       platform::returnFreeMemory();
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
@@ -206,7 +208,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), listener, countersFile, metricsFile, loop);
+  serve(services, daemon, listener, countersFile, metricsFile, loop);
 
   const bool ended = stop(services, listener, control, countersFile);
   daemon.backends().sayRest();
