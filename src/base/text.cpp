@@ -131,6 +131,19 @@ bool containsIgnoringCase(std::string_view text, std::string_view part) {
   return lowerCase(text).find(lowerCase(part)) != std::string::npos;
 }
 
+TextPlace placeInText(std::string_view text, std::size_t offset) {
+  TextPlace place;
+  for (const char c : text.substr(0, offset)) {
+    if (c == '\n') {
+      ++place.line;
+      place.column = 1;
+    } else if ((static_cast<unsigned char>(c) & 0xc0) != 0x80) {  // no continuation byte
+      ++place.column;
+    }
+  }
+  return place;
+}
+
 std::string percentEncoded(std::string_view text, std::string_view kept) {
   constexpr std::string_view kUnreserved =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-._~";

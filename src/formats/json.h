@@ -1,8 +1,10 @@
 // JSON by RFC 8259 to and from Value. Any thread. Exceptions: none.
 #pragma once
 
+#include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/result.h"
 #include "base/value.h"
@@ -18,6 +20,11 @@ struct JSONError {
 // 1970} becomes a date, {"$data": "base64"} data; null entries of a dictionary are left out, elsewhere null
 // is an error. Depth at most 64; duplicate keys: the last one counts.
 Result<Value, JSONError> parseJSON(std::string_view text);
+// The same where "// …" and "/* … */" may stand between the tokens.
+Result<Value, JSONError> parseJSONWithComments(std::string_view text);
+// Where in a text that parseJSONWithComments takes the key or the element of an array begins that `path`
+// leads to: keys, and numbers of elements from 0 in decimal. Nothing: it is not there.
+std::optional<std::size_t> offsetInJSON(std::string_view text, const std::vector<std::string>& path);
 
 enum class JSONStyle { compact, pretty };
 // The reverse of parseJSON. A real that is not finite is written as null; a text that is no UTF-8 is mended.

@@ -80,7 +80,7 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   }
   auto value = formats::parsePropertyList(bytes);
   if (value) return std::move(value).value();
-  return Failure{"no property list: " + value.error().detail};
+  return Failure{"no property list: " + value.error().description()};
 }
 
 std::optional<std::string> makeSigningKey(const std::string& privatePath, const std::string& publicPath) {
