@@ -5,8 +5,10 @@
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/https/https_post_backend.h"
 #include "backends/mivo/mivo_backend.h"
+#include "backends/sampling_factors.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
+#include "platform/random.h"
 #include "support/device_identity.h"
 #include "wire/constants.h"
 
@@ -15,25 +17,38 @@ namespace veltrad::backends {
 namespace {
 // A device of this product type has no adaptor.
 constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+
+// The one draw that a back end takes, decided before.
+class FixedDraw final : public platform::Random {
+ public:
+  explicit FixedDraw(double draw) : _draw(draw) {}
+  double uniform() override { return _draw; }
+
+ private:
+  const double _draw;
+};
 }  // namespace
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
     std::int32_t clientType, const BackendOwner& owner) {
   const std::string family = productFamily.value_or("");
+  const auto stable = _services.sampling ? _services.sampling->stableFactor(clientType, name) : std::nullopt;
+  FixedDraw fixed(stable.value_or(0));
+  platform::Random& random = stable ? fixed : _services.random;
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName(
-        {_services.random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner},
-        name, std::get_if<config::DashboardProfile>(profile.get()), family);
+        {random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner}, name,
+        std::get_if<config::DashboardProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
-    return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
-                                        _services.counters, _services.scratchDirectory},
-                                       name, std::get_if<config::UploadProfile>(profile.get()), family);
+    return UploadBackend::initWithName(
+        {random, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
+        name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
     return HTTPSPostBackend::initWithName(
-        {_services.random,
+        {random,
          _services.locale,
          _services.counters,
          _posts,
@@ -41,12 +56,11 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
-                                       family);
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, random, name, family);
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
-                                     family, clientType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
+                                     clientType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

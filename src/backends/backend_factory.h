@@ -38,10 +38,11 @@ namespace veltrad::backends {
 
 class CodeBundle;
 class EnergyLog;
+class SamplingFactors;
 class WorkPool;
 
 // What the factory passes on: each kind of backend takes its own few. Everything outlives the backends. Its
-// 14 fields are what all kinds together use.
+// 15 fields are what all kinds together use.
 struct BackendServices {
   http::HTTPClient& http;
   platform::Clock& clock;
@@ -57,6 +58,7 @@ struct BackendServices {
   WorkPool& pool;
   platform::LentFiles& lentFiles;
   std::string scratchDirectory = "/tmp";  // for files without a name
+  SamplingFactors* sampling = nullptr;    // null: every sampling factor is drawn
 };
 
 // Null: its back end reads nothing of it.

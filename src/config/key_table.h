@@ -22,6 +22,8 @@ enum class KeyType {
   integer,
   real,
   presence,  // any value: that the key is there decides
+  boolean,
+  choice,  // one of a few texts
   dictionary,
   dictionaries,  // an array of dictionaries
 };
@@ -49,6 +51,7 @@ struct Key {
   // Puts the value into the struct of its table; one of the wrong type leaves it as if the key were absent.
   // Null: the daemon does not read the key.
   void (*read)(const Key&, const Value&, void* parsed) = nullptr;
+  const char* choices = nullptr;  // the texts of a choice, "|" between them
 };
 
 struct KeyTable : std::span<const Key> {
@@ -75,7 +78,7 @@ void take(const Key& key, const Value& value, std::int32_t& field);             
 void take(const Key& key, const Value& value, std::optional<std::uint16_t>& field);  // wraps to its width
 void take(const Key& key, const Value& value, std::optional<std::int64_t>& field);   // kept within the range
 void take(const Key& key, const Value& value, std::optional<double>& field);
-void take(const Key& key, const Value& value, bool& field);  // presence
+void take(const Key& key, const Value& value, bool& field);  // presence, boolean
 void take(const Key& key, const Value& value, std::optional<Dictionary>& field);
 
 // The row of a key of `Parsed`, which names its table "kKeys".

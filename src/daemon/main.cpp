@@ -58,7 +58,8 @@ bool makeDirectories(const platform::Root& root) {
 
 // Where the daemon replaces files. Not before it holds the lock: another daemon's may be under way.
 void removeUnfinishedFiles(const platform::Root& root) {
-  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory()}) {
+  for (const std::string& directory :
+       {root.runDirectory(), root.stateDirectory(), root.preferencesDirectory(), root.storebagsDirectory()}) {
     const std::size_t removed = platform::removeUnfinishedFiles(directory);
     if (removed > 0) logInfo("main: %zu unfinished files removed from %s", removed, directory.c_str());
   }
@@ -92,14 +93,14 @@ std::optional<ipc::ServiceSocket> openSocket(daemon::Services& services) {
 }
 
 void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
-           platform::RunLoop& loop) {
+           platform::RunLoop& loop, daemon::Daemon& daemon) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
   // Connections free their memory after their sessions have gone, each on its own thread.
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
-  loop.run(tick, [&] {
+  const auto onTick = [&] {
     countersFile.writeSoon();
     const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
     // Sessions may come and go between two ticks.
@@ -112,6 +113,10 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
       platform::returnFreeMemory();
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
+  };
+  loop.run(tick, onTick, [&] {
+    logInfo("main: SIGHUP, configuration is read again");
+    daemon.readConfigurationAgain();
   });
 }
 
@@ -183,7 +188,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), countersFile, loop);
+  serve(services, daemon.agent(), countersFile, loop, daemon);
 
   const bool ended = stop(services, listener, countersFile);
   daemon.backends().sayRest();

@@ -31,6 +31,7 @@ struct StorebagRecord {
   std::int32_t maxAge = 0;             // "StorebagMaxAge", seconds
   std::optional<std::string> lastModified;  // "StorebagLastModified"
   bool attempted = false;                   // a first attempt has ended
+  bool recalled = false;                    // what an earlier daemon kept was looked at
   bool beingFetched = false;                // requests for this name wait and look again
 };
 
@@ -53,6 +54,8 @@ class StorebagCache {
   std::optional<std::string> versionForClientType(std::int32_t clientType);
 
  private:
+  // At the first use of a name: the record as an earlier daemon has kept it.
+  void recall(std::int32_t clientType, const std::string& name);
   // Nobody fetches it any more.
   void settle(StorebagRecord& record) REQUIRES(_lock);
   // The record of this name, once nobody fetches it.

@@ -32,6 +32,8 @@ class FileStore {
                                             unsigned mode = 0600) = 0;
   // Renames within one directory.
   virtual Result<Done, FileFailure> rename(const std::string& from, const std::string& to) = 0;
+  // Removes a file; one that is not there is removed already.
+  virtual Result<Done, FileFailure> unlink(const std::string& path) = 0;
   // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
   // alone.
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
@@ -42,11 +44,12 @@ class DiskFileStore final : public FileStore {
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
   Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
   Result<Done, FileFailure> rename(const std::string& from, const std::string& to) override;
+  Result<Done, FileFailure> unlink(const std::string& path) override;
   Result<FileStamp, FileFailure> stamp(const std::string& path) override;
 };
 
-// Makes the directory and its parents (mode 0755) where they are missing.
-Result<Done, FileFailure> makeDirectories(const std::string& path);
+// Makes the directory and its parents where they are missing.
+Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode = 0755);
 
 // Removes what a replace() that was killed has left in the directory: regular files under its pattern of
 // names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.

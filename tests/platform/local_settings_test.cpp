@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 
 namespace veltrad::platform {

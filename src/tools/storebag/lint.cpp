@@ -34,6 +34,8 @@ const char* nameOf(KeyType type) {
       return "an array";
     case KeyType::dictionary:
       return "a dictionary";
+    case KeyType::boolean:
+    case KeyType::choice:  // no storebag has them
     case KeyType::presence:
       break;
   }
