@@ -8,8 +8,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdint>
-#include <cstdlib>
 #include <functional>
 #include <thread>
 #include <vector>
@@ -55,13 +53,13 @@ int main() {
   config::DashboardProfile section;
   section.ip = "127.0.0.1";
   section.port = ntohs(address.sin_port);
-  const auto backend = world.factory.newBackendWithName(
-      wire::kVeltraBackendDashboard, std::make_shared<const config::Profile>(section), "Elm", 7);
-  if (!backend) return 1;
   backends::SessionFacts facts;
   facts.compType = 7;
   facts.device.udid = std::string(40, 'a');
-  backend->setFacts(std::make_shared<const backends::SessionFacts>(facts));
+  const auto backend = world.factory.newBackendWithName(
+      wire::kVeltraBackendDashboard, std::make_shared<const config::Profile>(section), "Elm",
+      std::make_shared<const backends::SessionFacts>(facts));
+  if (!backend) return 1;
   Dictionary payload;
   for (int i = 0; i < 8; ++i) payload.set("key" + std::to_string(i), "a value of " + std::to_string(i));
   payload.set("seconds", 12.5);

@@ -8,8 +8,6 @@
 #include <algorithm>
 #include <chrono>
 #include <cstdio>
-#include <cstring>
-#include <functional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -24,7 +22,7 @@ namespace {
 using namespace veltrad;
 using Clock = std::chrono::steady_clock;
 
-// Many short rounds; in the best of them nothing else was running.
+// With many short rounds, the best ones are not disturbed by other processes.
 constexpr int kRounds = 400;
 constexpr int kCallsARound = 200;
 

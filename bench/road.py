@@ -5,13 +5,10 @@ import json
 import os
 import pathlib
 import subprocess
-import sys
 import time
 
-SOURCE = pathlib.Path(__file__).resolve().parent.parent
-os.environ.setdefault("VELTRA_BUILD", str(SOURCE / "build" / "release"))
-sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
-from harness import Daemon, Lab, Root, program, wait_until  # noqa: E402
+from family import Daemon, Lab, Root
+from harness import program, wait_until
 
 SESSIONS = 100
 
@@ -22,6 +19,7 @@ def memory_kib(pid):
 
 
 def cpu_seconds(pid):
+    """CPU time of all threads, including those that have ended."""
     fields = pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()
     return (int(fields[11]) + int(fields[12])) / os.sysconf("SC_CLK_TCK")
 

@@ -6,13 +6,10 @@ import pathlib
 import random
 import statistics
 import subprocess
-import sys
 import time
 
-SOURCE = pathlib.Path(__file__).resolve().parent.parent
-os.environ.setdefault("VELTRA_BUILD", str(SOURCE / "build" / "release"))
-sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
-from harness import Daemon, Lab, Root, program, storebag  # noqa: E402
+from family import Daemon, Lab, Root, storebag
+from harness import program
 
 SIZE, ROUNDS, MIB = 100 << 20, 5, 1 << 20
 POST = """gzip -6 < "$0" | curl -s --cacert "$1" -H 'Content-Type: application/octet-stream' -H 'Content-Encoding: gzip' \

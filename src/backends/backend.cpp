@@ -1,4 +1,4 @@
-// The base behaviour of every backend.
+// The default behaviour of back ends.
 #include "backends/backend.h"
 
 #include <openssl/evp.h>
@@ -7,7 +7,6 @@
 #include <utility>
 
 #include "base/text.h"
-#include "platform/random.h"
 
 namespace veltrad::backends {
 
@@ -22,7 +21,7 @@ std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
 }
 
 void VeltraBackend::updateState() {
-  setState(kBackendReporting);
+  setState({kBackendReporting, wire::Reason::always});
 }
 
 std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
@@ -49,12 +48,12 @@ bool VeltraBackend::uploadLogData(const Array&) {
   return false;
 }
 
-std::shared_ptr<const SessionFacts> VeltraBackend::facts() const {
+SharedFacts VeltraBackend::facts() const {
   const Lock held(_mutex);
   return _facts;
 }
 
-void VeltraBackend::setFacts(std::shared_ptr<const SessionFacts> facts) {
+void VeltraBackend::setFacts(SharedFacts facts) {
   const Lock held(_mutex);
   _facts.swap(facts);
 }
@@ -81,6 +80,17 @@ std::optional<double> VeltraBackend::samplingThreshold() const {
 void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
   const Lock held(_mutex);
   _samplingThreshold = value;
+}
+
+BackendActivity VeltraBackend::activity() const {
+  const Lock held(_mutex);
+  return {0, _postsUnderWay.load(std::memory_order_relaxed), _lastOutcome};
+}
+
+void VeltraBackend::postEnded(std::string outcome) {
+  _postsUnderWay.fetch_sub(1, std::memory_order_relaxed);
+  const Lock held(_mutex);
+  _lastOutcome.swap(outcome);
 }
 
 }  // namespace veltrad::backends

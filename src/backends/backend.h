@@ -1,5 +1,5 @@
-// VeltraBackend: the base of every reporting backend. Its session's thread configures it, sends and flushes;
-// other sessions' threads and the HTTP thread reach its facts, its state and its sampling threshold.
+// VeltraBackend, the base of all back ends. The session's thread configures it, sends and flushes; other
+// sessions' threads and the HTTP thread use its facts, state and sampling threshold.
 #pragma once
 
 #include <atomic>
@@ -15,31 +15,39 @@
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
+#include "platform/counters.h"
+#include "platform/random.h"
 #include "wire/error.h"
-
-namespace veltrad::platform {
-class Counters;
-class Random;
-}  // namespace veltrad::platform
+#include "wire/reasons.h"
 
 namespace veltrad::backends {
 
-// State of a backend. 2 and 3 count as reporting for the client.
+// The state of a back end. A client is told that 2 and 3 report.
 enum BackendState : std::int32_t {
-  kBackendWaiting = 0,  // before the first updateState, or user info is required and missing
+  // Before the first updateState, or required user info is missing.
+  kBackendWaiting = 0,
   kBackendDisabled = 1,
   kBackendReporting = 2,
-  kBackendHeld = 3,  // sampled out, but held instead of disabled
+  // Sampled out, but held instead of disabled.
+  kBackendHeld = 3,
 };
 
-// Who has a back end made.
-struct BackendOwner {
-  std::shared_ptr<platform::MemoryAccount> account = nullptr;  // null: nobody pays
-  bool oneShot = false;                                        // for one message, not for a session
+// A state and why. Aligned so that the two change in one indivisible store.
+struct alignas(8) StateVerdict {
+  std::int32_t state = kBackendWaiting;
+  wire::Reason reason = wire::Reason::waits_for_user_info;
 };
 
+// What a back end has to do with its messages just now.
+struct BackendActivity {
+  std::size_t held = 0;      // events that wait for a flush, datagrams that wait for the socket
+  std::size_t underWay = 0;  // posts without an answer, datagrams without an acknowledgement
+  std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
+};
+
+// The payload may be null.
 struct NumberedMessage {
-  const Dictionary* payload = nullptr;  // null: none
+  const Dictionary* payload = nullptr;
   platform::TimeValue timestamp;
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
@@ -47,29 +55,27 @@ struct NumberedMessage {
   std::int32_t flag = 0;
 };
 
-// One backend of one session. It outlives its session only while work of its own is under way.
+// One back end of one session. It outlives its session only while its own work is under way.
 class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  public:
-  // A result text or none, an error or none; may run on another thread, exactly once.
+  // Gets an optional result text and an optional error. Called exactly once, possibly on another thread.
   using FlushCompletion =
       std::function<void(std::optional<std::string>, std::optional<wire::ReportingError>)>;
 
   virtual ~VeltraBackend() = default;
-  VeltraBackend(const VeltraBackend&) = delete;
-  VeltraBackend& operator=(const VeltraBackend&) = delete;
 
   // Lower-case hexadecimal SHA-256 of the text's UTF-8 bytes, 64 characters.
   static std::string convertIntoSHA256(std::string_view text);
 
-  // Called before the session lets the backend go.
+  // Called before the session releases the back end.
   virtual void cleanup() {}
   virtual void updateState();
 
-  // Numbers the message (1, 2, … 65535, 0, …) and passes it on. The text that comes back says what was sent.
+  // Numbers the message (1, 2, … 65535, 0, …) and passes it on. Returns a text about what was sent.
   std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
                                          std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
   virtual std::optional<std::string> sendNumberedMessage(const NumberedMessage& message);
-  // The base completes at once with neither text nor error. `completion` may be empty.
+  // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
   virtual bool uploadLogData(const Array& logData);
@@ -78,22 +84,28 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Constant after construction.
   const std::string& name() const { return _name; }
   const std::string& productFamily() const { return _productFamily; }
-  double samplingFactor() const { return _samplingFactor; }  // in [0, 1), drawn once
+  // In [0, 1), drawn once.
+  double samplingFactor() const { return _samplingFactor; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
 
-  // Any thread, at any time. The facts that a reader has taken stay as they are; never null.
-  std::shared_ptr<const SessionFacts> facts() const;
-  void setFacts(std::shared_ptr<const SessionFacts> facts);
+  // Any thread. Never null; a change of the facts does not affect those that a caller already has.
+  SharedFacts facts() const;
+  void setFacts(SharedFacts facts);
   void setUserInfoDict(SharedDictionary userInfo);
-  std::int32_t state() const { return _state.load(std::memory_order_relaxed); }
-  void setState(std::int32_t value) { _state.store(value, std::memory_order_relaxed); }
+  std::int32_t state() const { return stateVerdict().state; }
+  StateVerdict stateVerdict() const { return _state.load(std::memory_order_relaxed); }
+  void setState(StateVerdict verdict) { _state.store(verdict, std::memory_order_relaxed); }
   std::int32_t hierarchy() const { return _hierarchy.load(std::memory_order_relaxed); }
   void setHierarchy(std::int32_t value) { _hierarchy.store(value, std::memory_order_relaxed); }
   std::optional<double> samplingThreshold() const;
   void setSamplingThreshold(std::optional<double> value);
+  virtual BackendActivity activity() const;
+  // A post begins; it ended so.
+  void postBegins() { _postsUnderWay.fetch_add(1, std::memory_order_relaxed); }
+  void postEnded(std::string outcome);
 
  protected:
-  // Stores copies and draws the sampling factor. The kinds' initWithName(…) come here.
+  // Draws the sampling factor.
   VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
 
@@ -107,13 +119,14 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // The session's thread only.
   std::uint16_t _eventID = 0;
 
-  // Each indivisible on its own.
-  std::atomic<std::int32_t> _state{kBackendWaiting};
+  std::atomic<StateVerdict> _state{StateVerdict()};
+  std::atomic<std::uint32_t> _postsUnderWay{0};
   std::atomic<std::int32_t> _hierarchy{0};
 
   mutable Mutex _mutex BACKEND_LOCK;
-  std::shared_ptr<const SessionFacts> _facts GUARDED_BY(_mutex) = std::make_shared<const SessionFacts>();
+  SharedFacts _facts GUARDED_BY(_mutex) = std::make_shared<const SessionFacts>();
   std::optional<double> _samplingThreshold GUARDED_BY(_mutex);
+  std::string _lastOutcome GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::backends

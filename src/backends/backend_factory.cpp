@@ -1,4 +1,4 @@
-// The names of the backends and the kinds behind them.
+// Maps names to kinds of back ends.
 #include "backends/backend_factory.h"
 
 #include "backends/ampery/ampery_backend.h"
@@ -9,13 +9,12 @@
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
 #include "platform/random.h"
-#include "support/device_identity.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
 
 namespace {
-// A device of this product type has no adaptor.
+// Devices of this product type have no adaptor.
 constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 
 // The one draw that a back end takes, decided before.
@@ -31,15 +30,24 @@ class FixedDraw final : public platform::Random {
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
-    std::int32_t clientType, const BackendOwner& owner) {
+    const SharedFacts& facts, bool oneShot) {
+  auto made = make(name, profile, productFamily, *facts, oneShot);
+  if (made) made->setFacts(facts);
+  return made;
+}
+
+std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, const SharedProfile& profile,
+                                                    const std::optional<std::string>& productFamily,
+                                                    const SessionFacts& facts, bool oneShot) {
   const std::string family = productFamily.value_or("");
-  const auto stable = _services.sampling ? _services.sampling->stableFactor(clientType, name) : std::nullopt;
+  const auto stable =
+      _services.sampling ? _services.sampling->stableFactor(facts.compType, name) : std::nullopt;
   FixedDraw fixed(stable.value_or(0));
   platform::Random& random = stable ? fixed : _services.random;
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName(
-        {random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner}, name,
-        std::get_if<config::DashboardProfile>(profile.get()), family);
+    return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
+                                           _logData, _dashboards, facts.account, oneShot},
+                                          name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName(
@@ -60,7 +68,7 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
-                                     clientType);
+                                     facts.compType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -1,7 +1,6 @@
-// Makes backends by name. Any thread.
+// Makes back ends by name. Any thread.
 #pragma once
 
-#include <cstdint>
 #include <memory>
 #include <string>
 
@@ -10,29 +9,13 @@
 #include "backends/dashboard/log_data_uploads.h"
 #include "backends/https/event_posts.h"
 #include "backends/upload/file_uploads.h"
+#include "config/process_settings.h"
 #include "config/storebag_content.h"
-
-namespace veltrad::config {
-class ProcessSettings;
-}  // namespace veltrad::config
-
-namespace veltrad::http {
-class HTTPClient;
-}  // namespace veltrad::http
-
-namespace veltrad::platform {
-class Clock;
-class Counters;
-class LentFiles;
-class Locale;
-class Preferences;
-class Random;
-}  // namespace veltrad::platform
-
-namespace veltrad::support {
-class DeviceIdentity;
-class Veltra;
-}  // namespace veltrad::support
+#include "platform/lent_files.h"
+#include "platform/locale.h"
+#include "platform/preferences.h"
+#include "support/device_identity.h"
+#include "support/veltra.h"
 
 namespace veltrad::backends {
 
@@ -41,8 +24,8 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// What the factory passes on: each kind of backend takes its own few. Everything outlives the backends. Its
-// 15 fields are what all kinds together use.
+// Its 15 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
   platform::Clock& clock;
@@ -57,11 +40,13 @@ struct BackendServices {
   const support::Veltra& library;
   WorkPool& pool;
   platform::LentFiles& lentFiles;
-  std::string scratchDirectory = "/tmp";  // for files without a name
-  SamplingFactors* sampling = nullptr;    // null: every sampling factor is drawn
+  // Where temporary files are made.
+  std::string scratchDirectory = "/tmp";
+  // Null: every sampling factor is drawn.
+  SamplingFactors* sampling = nullptr;
 };
 
-// Null: its back end reads nothing of it.
+// A back end's section of a storebag. Null for a back end that reads no section.
 using SharedProfile = std::shared_ptr<const config::Profile>;
 
 class BackendFactory {
@@ -70,15 +55,19 @@ class BackendFactory {
       : _services(services),
         _posts(services.http, services.clock, services.counters),
         _logData(services.http, services.counters) {}
-  // Null: no such backend here, or it cannot work with this profile; one line has said so. `profile` as the
-  // section of a storebag has it under the name.
+  // Returns a back end that has these facts. Null, after one log line, if the name is unknown or the profile
+  // is not sufficient. `oneShot`: the back end serves a single message instead of a session.
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    std::int32_t clientType, const BackendOwner& owner = {});
-  // The lines that were held back: before the daemon ends.
+                                                    const SharedFacts& facts, bool oneShot = false);
+  // Logs the lines that were held back. Called before the daemon ends.
   void sayRest() { _posts.sayRest(); }
 
  private:
+  std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,
+                                      const std::optional<std::string>& productFamily,
+                                      const SessionFacts& facts, bool oneShot);
+
   const BackendServices _services;
   EventPosts _posts;
   LogDataUploads _logData;

@@ -1,4 +1,4 @@
-// Where the locks of this room stand in the order of all (base/mutex.h).
+// The place of this room's locks in the lock order (base/mutex.h).
 #pragma once
 
 #include "base/mutex.h"

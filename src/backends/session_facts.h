@@ -1,4 +1,4 @@
-// What a session tells its back ends of itself, its client and the device. Plain values.
+// What a session tells its back ends about itself, its client and the device.
 #pragma once
 
 #include <cstdint>
@@ -8,24 +8,22 @@
 #include <string>
 
 #include "base/value.h"
-
-namespace veltrad::platform {
-class MemoryAccount;
-}  // namespace veltrad::platform
+#include "platform/memory_budget.h"
 
 namespace veltrad::backends {
 
 using SharedDictionary = std::shared_ptr<const Dictionary>;
 
 struct DeviceFacts {
-  std::string udid;  // the device's identifier; may be empty
+  // The device's identifier; may be empty.
+  std::string udid;
   std::optional<std::string> productVersion;
   std::optional<std::string> buildVersion;
   std::optional<std::string> hardwareType;
   bool isInternal = false;
 };
 
-// Of the client library.
+// The version of the client library.
 struct SelfVersion {
   // "9.3" gives 9 and 3, "10" gives 10 and 0; each modulo 256.
   static SelfVersion of(const std::string& version) {
@@ -40,18 +38,29 @@ struct SelfVersion {
   std::uint8_t minor = 0;
 };
 
+// The pointers may be null.
 struct SessionFacts {
   DeviceFacts device;
   SelfVersion selfVersion;
   std::uint32_t sessionID = 0;
-  std::int32_t compType = 0;  // the client type
+  // The client type.
+  std::int32_t compType = 0;
   std::uint16_t clientVersion = 0;
   bool requireUserInfo = false;
-  bool batchEvents = false;   // unless a client entry says otherwise
-  double startTimeStamp = 0;  // seconds since 1970
-  SharedDictionary userInfo;  // null: none
+  // A client entry of the storebag may override it.
+  bool batchEvents = false;
+  // Seconds since 1970.
+  double startTimeStamp = 0;
+  SharedDictionary userInfo;
   std::optional<std::string> combinedSessionIDString;
-  std::shared_ptr<platform::MemoryAccount> account;  // charged with what is kept; null: nobody pays
+  // Pays for what is kept.
+  std::shared_ptr<platform::MemoryAccount> account;
 };
+using SharedFacts = std::shared_ptr<const SessionFacts>;
+
+// Client types 7, 11 and 13: they have an adaptor, and numeric session IDs on internal builds.
+constexpr bool isAdaptorClientType(std::int32_t clientType) {
+  return clientType == 7 || clientType == 11 || clientType == 13;
+}
 
 }  // namespace veltrad::backends

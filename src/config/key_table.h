@@ -22,10 +22,10 @@ enum class KeyType {
   integer,
   real,
   presence,  // any value: that the key is there decides
-  boolean,
-  choice,  // one of a few texts
   dictionary,
   dictionaries,  // an array of dictionaries
+  boolean,
+  choice,  // one of a few texts
 };
 
 // Of a number. What lies outside is read all the same, as the key's field says.

@@ -1,4 +1,4 @@
-// Looking up sessions by their level.
+// Finds sessions by their level.
 #include "daemon/correlated_list.h"
 
 #include <algorithm>

@@ -1,5 +1,4 @@
-// Sessions that share a user-info key, in the order of joining, with an index of their levels. Under the
-// families' lock.
+// Sessions that share a user-info key, ordered by level and time of joining. Guarded by the families' lock.
 #pragma once
 
 #include <cstdint>
@@ -14,9 +13,8 @@
 
 namespace veltrad::daemon {
 
-// What the sessions above a level are called together: their ID strings from the root to the parent, joined
-// by
-// ".". `complete` is false when one of them is missing; the text then begins after the gap.
+// The ID strings of the sessions above a level, from the root to the parent, joined by ".". If one is
+// missing, `complete` is false and the text begins after the gap.
 struct AncestorIDs {
   std::string text;
   bool complete = true;
@@ -24,36 +22,37 @@ struct AncestorIDs {
 
 struct FamilyMember;
 
-// Members outlive their time in it.
+// A member must leave before it is destroyed.
 class CorrelatedList {
  public:
-  void join(FamilyMember& member);  // at the end; it is in none
+  void join(FamilyMember& member);
   void leave(const FamilyMember& member);
   void refreshLevel(FamilyMember& member);
   bool empty() const { return _members.empty(); }
 
-  // The first that joined of those with this hierarchy number, or null.
+  // The first member that joined with this hierarchy number, or null.
   const FamilyMember* getFirstSessionWithHierarchy(std::int64_t hierarchy) const;
-  // The first of each level from 0 to `hierarchy` - 1, from the root down: the first of these that
+  // Looks at the first member of each level above `hierarchy`, from the root down. Returns the first that
   // aggregates, or null.
   const FamilyMember* topmostAggregator(std::int32_t hierarchy) const;
   AncestorIDs ancestorIDs(std::int32_t hierarchy) const;
-  // Those with a greater hierarchy number, in the order of joining.
+  // The members with a greater hierarchy number, in the order of joining.
   std::vector<const FamilyMember*> below(std::int32_t hierarchy) const;
 
  private:
   std::uint64_t _nextJoined = 0;
-  std::map<std::pair<std::int64_t, std::uint64_t>, const FamilyMember*> _members;  // by level, then joining
+  // By level, then order of joining.
+  std::map<std::pair<std::int64_t, std::uint64_t>, const FamilyMember*> _members;
 };
 
-using CorrelatedLists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;  // by user-info key
+using CorrelatedLists = std::pmr::map<std::pmr::string, CorrelatedList, std::less<>>;
 
-// A session as its family knows it.
 struct FamilyMember {
-  session::FamilyFacts facts;      // that it told last
-  std::string key;                 // of the user info in them
-  CorrelatedLists::iterator home;  // the one list that it is in
-  // That list's alone. The level is the hierarchy number at the last refreshLevel().
+  session::FamilyFacts facts;
+  // The user-info key of the facts. The member may still be in the list of an earlier key.
+  std::string key;
+  CorrelatedLists::iterator home;
+  // Used by that list only. The level is the hierarchy number at the last refreshLevel().
   std::int32_t level = 0;
   std::uint64_t joined = 0;
 };

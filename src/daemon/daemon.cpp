@@ -1,4 +1,4 @@
-// Which room gets which services.
+// Passes the services to the rooms.
 #include "daemon/daemon.h"
 
 namespace veltrad::daemon {

@@ -1,8 +1,5 @@
-// The daemon's rooms wired by hand, and the order in which they stop. Main thread.
+// Connects the daemon's rooms. Main thread.
 #pragma once
-
-#include <chrono>
-#include <cstddef>
 
 #include "backends/backend_factory.h"
 #include "backends/sampling_factors.h"
@@ -20,8 +17,7 @@
 
 namespace veltrad::daemon {
 
-// Everything between the platform's services and the listener. The services outlive it; it outlives the
-// listener.
+// The objects between the services and the listener. The services outlive it; it outlives the listener.
 class Daemon {
  public:
   explicit Daemon(Services& services);

@@ -1,18 +1,25 @@
-// Who joins and leaves, the refreshing of a chain, and where a copy goes.
+// Adds and removes sessions, refreshes families and finds the session that gets a copy.
 #include "daemon/families.h"
 
 #include <utility>
 
-#include "daemon/user_info_key.h"
+#include "base/text.h"
 #include "platform/log.h"
+#include "wire/constants.h"
 
 namespace veltrad::daemon {
 
 namespace {
-// Of lists that nobody is in any more: so many identities, and no long names, or clients that invent them
-// grow the daemon without end.
+// Bounds for empty lists, because clients may invent identities. The length is in bytes.
 constexpr std::size_t kMostKeys = 4096;
-constexpr std::size_t kLongestIdleKey = 256;  // bytes
+constexpr std::size_t kLongestIdleKey = 256;
+
+// The lower-cased client name, ":", the lower-cased service name. A missing name is empty.
+std::string userInfoKeyForUserInfo(const Dictionary* userInfo) {
+  const std::string* client = userInfo ? userInfo->string(wire::kVeltraUserInfoClientName) : nullptr;
+  const std::string* service = userInfo ? userInfo->string(wire::kVeltraUserInfoServiceName) : nullptr;
+  return (client ? lowerCase(*client) : "") + ":" + (service ? lowerCase(*service) : "");
+}
 }  // namespace
 
 void Families::tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) {
@@ -45,6 +52,17 @@ void Families::userInfoUpdatedForSession(session::FamilyFacts facts) {
   _userInfoKeyCount.store(_correlatedSessions.size(), std::memory_order_relaxed);
 }
 
+Families::Parents Families::parents() {
+  Parents parents;
+  const Lock held(_lock);
+  for (const auto& [session, member] : _members) {
+    const FamilyMember* parent =
+        member.home->second.getFirstSessionWithHierarchy(std::int64_t{member.level} - 1);
+    if (parent) parents.emplace(session, parent->facts.aggregation.get());
+  }
+  return parents;
+}
+
 void Families::leave(const session::Aggregation& session) {
   Members::node_type left;
   const Lock held(_lock);
@@ -67,7 +85,7 @@ const CorrelatedList* Families::list(std::string_view key) const {
   return found == _correlatedSessions.end() ? nullptr : &found->second;
 }
 
-// The list of the key that the session told last; null, with a log line, where it is not in it.
+// The list of the member's key; null, after a log line, if the member is not in it.
 const CorrelatedList* Families::listHolding(const FamilyMember& member, const char* operation) const {
   const CorrelatedList* named = list(member.key);
   if (!named || named->empty()) {
@@ -115,7 +133,7 @@ const FamilyMember* Families::parentSession(const FamilyMember& member) const {
 }
 
 const FamilyMember* Families::ancestorWithAggregator(const session::FamilyPlace& place) const {
-  if (!place.userInfo || place.hierarchy < 1) return nullptr;  // which the session says
+  if (!place.userInfo || place.hierarchy < 1) return nullptr;
   const auto member = _members.find(&place.aggregation);
   const bool told = member != _members.end() && member->second.facts.userInfo == place.userInfo &&
                     std::string_view(member->second.home->first) == member->second.key;

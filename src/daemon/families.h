@@ -1,9 +1,10 @@
-// Families: sessions that share an identity, and what that makes of each: its parent, its combined ID, its
-// back ends' states, the one client that gets copies.
+// Families: the sessions that share an identity. Determines each session's parent and combined ID, its back
+// ends' states, and which client gets copies.
 #pragma once
 
 #include <atomic>
 #include <cstddef>
+#include <map>
 #include <memory_resource>
 #include <optional>
 #include <string>
@@ -16,12 +17,12 @@
 
 namespace veltrad::daemon {
 
-// Any thread; one lock. Knows of a session what it was told, and calls none: under the lock it reads and sets
-// states and IDs of back ends and queues copies and end marks, which wait for nobody. What a refresh has
-// computed is set before the lock is let go, or an older one could follow a newer one.
+// Any thread. Does not call sessions; it knows what they have told it. Under its lock it reads and sets
+// states and IDs of back ends, and queues copies and end marks, none of which block. The results of a refresh
+// are set under the lock, because they must not overwrite those of a later one.
 class Families {
  public:
-  // Of a member; nothing for others.
+  // Does nothing if the session is in no family.
   void sessionInfoUpdated(session::FamilyFacts facts);
   void userInfoUpdatedForSession(session::FamilyFacts facts);
   void updateDownstreamSessions(session::FamilyFacts facts);
@@ -30,13 +31,17 @@ class Families {
   bool ancestorAggregates(const session::FamilyPlace& place);
   session::CopySent sendToAncestor(const session::FamilyPlace& place, std::string_view copy);
 
+  // The parent of each session that has one.
+  using Parents = std::map<const session::Aggregation*, const session::Aggregation*>;
+  Parents parents();
+
   // Without a lock.
   std::size_t userInfoKeyCount() const { return _userInfoKeyCount.load(std::memory_order_relaxed); }
 
  private:
   using Members = std::unordered_map<const session::Aggregation*, FamilyMember>;
 
-  // What they give back or swap away goes after the lock.
+  // What these return or swap out is destroyed after the lock is released.
   void tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
   Members::node_type takeOut(const session::Aggregation& session) REQUIRES(_lock);
   const CorrelatedList* list(std::string_view key) const REQUIRES(_lock);
@@ -46,12 +51,12 @@ class Families {
   const FamilyMember* ancestorWithAggregator(const session::FamilyPlace& place) const REQUIRES(_lock);
   void updateCombinedSessionID(const FamilyMember& member) const REQUIRES(_lock);
   void syncReportingStates(const FamilyMember& member) const REQUIRES(_lock);
-  // The lines that are to be logged once the lock is released.
+  // Returns lines to log after the lock is released.
   std::vector<std::string> refresh(FamilyMember& member) REQUIRES(_lock);
 
   Mutex _lock FAMILIES_LOCK;
-  // Empty lists stay, within a bound. They have memory of their own: each would otherwise hold a page of what
-  // the sessions beside it have freed.
+  // Empty lists are kept, up to a bound. They have a memory pool, so that they do not keep pages alive that
+  // sessions have otherwise freed.
   std::pmr::unsynchronized_pool_resource _listMemory GUARDED_BY(_lock);
   CorrelatedLists _correlatedSessions GUARDED_BY(_lock){&_listMemory};
   Members _members GUARDED_BY(_lock);

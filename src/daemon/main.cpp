@@ -1,4 +1,4 @@
-// veltrad: prepare the process, serve until a signal, stop in order. The main thread runs the loop only.
+// veltrad: prepares the process, serves until a signal, and stops in order.
 #include <unistd.h>
 
 #include <fmt/format.h>
@@ -10,6 +10,8 @@
 
 #include "base/version.h"
 #include "daemon/daemon.h"
+#include "daemon/metrics_file.h"
+#include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
 #include "platform/counters_file.h"
@@ -24,8 +26,15 @@ namespace {
 using namespace veltrad;
 using namespace std::chrono_literals;
 
-constexpr auto kStopBound = 10s;  // from the signal to the end of the process
-constexpr auto kTick = 1000ms;  // the watchdog is fed, and counters are handed to the disk writer this often
+// The longest time from the signal to the end of the process.
+constexpr auto kStopBound = 10s;
+// How often the counters are written and the watchdog is fed.
+constexpr auto kTick = 1000ms;
+// Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
+// may have.
+constexpr std::size_t kMostObservers = 64;
+constexpr std::size_t kMostObserversOfOneUser = 32;
+constexpr std::size_t kObserversForOwner = 2;
 
 constexpr const char* kHelp =
     "Usage: veltrad [--version | --help]\n"
@@ -37,11 +46,10 @@ constexpr const char* kHelp =
     "  --version  Print the version and exit\n"
     "  --help     Print this help and exit\n";
 
-// What is written to later must be there before the sandbox closes.
+// Directories must exist before the sandbox is entered.
 bool makeDirectories(const platform::Root& root) {
-  // Not written to, but what an administrator puts there later must be readable then: only what is there now
-  // can be let through the sandbox. Where it cannot be made, the file system says that nobody puts anything
-  // there.
+  // These are only read, and may fail: an administrator may add files later, and the sandbox admits only
+  // directories that exist now.
   static_cast<void>(platform::makeDirectories(root.configurationDirectory()));
   static_cast<void>(platform::makeDirectories(root.resourcesDirectory()));
   const std::string messageLog = root.messageLogDirectory();
@@ -56,7 +64,7 @@ bool makeDirectories(const platform::Root& root) {
   return true;
 }
 
-// Where the daemon replaces files. Not before it holds the lock: another daemon's may be under way.
+// Called after the daemon has taken its lock, because another daemon may be writing the files before.
 void removeUnfinishedFiles(const platform::Root& root) {
   for (const std::string& directory :
        {root.runDirectory(), root.stateDirectory(), root.preferencesDirectory(), root.storebagsDirectory()}) {
@@ -78,32 +86,35 @@ void enterSandbox(const platform::Root& root) {
   }
 }
 
-std::optional<ipc::ServiceSocket> openSocket(daemon::Services& services) {
-  const auto handedOver = services.serviceManager.handedOverSocket();
-  if (!handedOver.ok()) {
-    logError("main: %s", handedOver.error().c_str());
-    return std::nullopt;
-  }
-  auto socket = ipc::openServiceSocket(services.root, handedOver.value());
-  if (!socket.ok()) {
-    logError("main: %s", socket.error().c_str());
-    return std::nullopt;
-  }
-  return std::move(socket).value();
+struct Sockets {
+  ipc::ServiceSocket service;
+  ipc::ServiceSocket control;
+};
+
+Result<Sockets, std::string> openSockets(daemon::Services& services) {
+  const auto handedOver = services.serviceManager.handedOverSockets();
+  if (!handedOver) return Failure{handedOver.error()};
+  auto service = ipc::openServiceSocket(services.root, handedOver.value().service);
+  if (!service) return Failure{service.error()};
+  auto control = ipc::openControlSocket(services.root, handedOver.value().control);
+  if (!control) return Failure{control.error()};
+  return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
 void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
-           platform::RunLoop& loop, daemon::Daemon& daemon) {
+           daemon::MetricsFile& metricsFile, platform::RunLoop& loop, daemon::Daemon& daemon) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  // Connections free their memory after their sessions have gone, each on its own thread.
+  // Connections free memory on their own threads after their sessions have gone, so memory is returned
+  // several times.
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
   const auto onTick = [&] {
     countersFile.writeSoon();
+    metricsFile.writeSoon();
     const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
-    // Sessions may come and go between two ticks.
+    // Detects sessions that came and went between two ticks.
     const std::uint64_t acceptedNow = agent.acceptedSessions();
     if (!idle || acceptedNow != accepted) {
       accepted = acceptedNow;
@@ -120,24 +131,26 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
   });
 }
 
-// The listener first, so that every session sends its stop message; then what is still to be posted or sent;
-// then what that has left for the disk, the counters last. False: something still runs, so nothing may be
+// Stops the listener first, so that every session sends its stop message; then finishes posts and datagrams;
+// then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
-bool stop(daemon::Services& services, ipc::Listener& listener, platform::CountersFile& countersFile) {
+bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& control,
+          platform::CountersFile& countersFile) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
-  const std::size_t stuck = listener.invalidate(deadline - 1s);
+  std::size_t stuck = listener.invalidate(deadline - 1s);
+  stuck += control.invalidate(deadline - 1s);
   services.http.drain(deadline - 500ms);
   services.pool.drain(deadline - 300ms);
-  if (stuck == 0) services.pool.discard();  // which counts the datagrams that still waited
+  if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
   const bool written = countersFile.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
   if (!written) logWarning("main: the disk did not take everything within the time of a stop");
   return stuck == 0 && written;
 }
 
-// The status of the process, where the arguments alone decide it.
+// The exit status, if the arguments ask for no service.
 std::optional<int> answerArguments(int count, char** arguments) {
   if (count <= 1) return std::nullopt;
   const std::string_view argument = arguments[1];
@@ -173,24 +186,33 @@ int main(int count, char** arguments) {
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
   enterSandbox(services.root);
-  auto socket = openSocket(services);
-  if (!socket) return 1;
+  auto sockets = openSockets(services);
+  if (!sockets) {
+    logError("main: %s", sockets.error().c_str());
+    return 1;
+  }
   removeUnfinishedFiles(services.root);
 
-  services.writer.start();  // so that later no thread comes or goes but for clients
+  services.writer.start();
   platform::CountersFile countersFile(services.counters, services.files, services.writer,
                                       services.root.countersPath(), started);
   daemon::Daemon daemon(services);
-  ipc::Listener listener({std::move(*socket), services.entitlements, services.lentFiles, services.counters,
-                          services.memory, services.root.entitlementsPath()},
+  ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
+                          services.counters, services.memory, services.root.entitlementsPath()},
                          daemon.agent());
-  if (!listener.resume()) return 1;
+  daemon::Observers observers(services, daemon.agent(), listener, started);
+  ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
+                         services.counters, services.observersMemory, services.root.entitlementsPath(),
+                         kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
+                        observers);
+  daemon::MetricsFile metricsFile(observers, services.files, services.writer, services.root.metricsPath());
+  if (!listener.resume() || !control.resume()) return 1;
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), countersFile, loop, daemon);
+  serve(services, daemon.agent(), countersFile, metricsFile, loop, daemon);
 
-  const bool ended = stop(services, listener, countersFile);
+  const bool ended = stop(services, listener, control, countersFile);
   daemon.backends().sayRest();
   platform::VeltraLogging::stopLogging();
   if (!ended) _exit(0);

@@ -1,4 +1,4 @@
-// The real services, built once by a program's main and handed on by reference, a few to each room.
+// The daemon's services, made once by main and passed to the rooms by reference.
 #pragma once
 
 #include "backends/ampery/energy_log.h"
@@ -22,6 +22,7 @@
 
 namespace veltrad::daemon {
 
+// Its 18 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),
@@ -36,6 +37,8 @@ struct Services {
 
   const platform::Root root;
   platform::MemoryBudget memory;
+  // Of the control socket, so that clients that keep much do not keep those out who look for the reason.
+  platform::MemoryBudget observersMemory{{16u << 20, 8u << 20, 4u << 20, 32u << 20, 16u << 20}};
   platform::SystemClock clock;
   platform::UnseededSequence random;
   platform::DiskFileStore files;

@@ -1,13 +1,10 @@
-// When to download, and what a download leaves in the cache.
+// Decides when to download, and takes the result into the cache.
 #include "daemon/storebag_cache.h"
 
 #include <cmath>
 #include <new>
 
 #include "config/client_types.h"
-#include "config/storebag_content.h"
-#include "config/storebag_source.h"
-#include "platform/clock.h"
 #include "platform/log.h"
 
 namespace veltrad::daemon {
@@ -90,6 +87,11 @@ void StorebagCache::recall(std::int32_t clientType, const std::string& name) {
   record.maxAge = kept.answer.maxAge;
   record.lastModified = std::move(kept.answer.lastModified);
   record.attempted = true;
+}
+
+std::map<std::string, StorebagRecord> StorebagCache::records() {
+  const Lock held(_lock);
+  return _cachedStorebags;
 }
 
 void StorebagCache::settle(StorebagRecord& record) {

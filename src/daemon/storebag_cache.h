@@ -1,4 +1,4 @@
-// The storebags that the daemon holds, one record a name. Any thread.
+// The storebags that the daemon has downloaded, one record per name. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -7,37 +7,35 @@
 #include <optional>
 #include <string>
 
+#include "config/storebag_content.h"
+#include "config/storebag_source.h"
 #include "daemon/lock_ranks.h"
-
-namespace veltrad::config {
-class StorebagSource;
-struct StorebagSection;
-struct StorebagSectionAnswer;
-}  // namespace veltrad::config
-
-namespace veltrad::platform {
-class Clock;
-}  // namespace veltrad::platform
+#include "platform/clock.h"
 
 namespace veltrad::daemon {
 
-// What is kept of one storebag. Made at the first fetch for its name, never removed.
+// Made at the first fetch for its name, never removed.
 struct StorebagRecord {
-  std::shared_ptr<const config::StorebagSection>
-      data;                            // "StorebagData": the section last obtained; kept through failures
-  std::optional<std::string> version;  // "StorebagVersion"
-  double fetchTime = 0;                // "StorebagFetchTime": when the last attempt ended, seconds since 1970
-  bool fetchSuccessful = false;        // "StorebagFetchState": "Fetch Successful" or "Fetch Failure"
-  std::int32_t maxAge = 0;             // "StorebagMaxAge", seconds
-  std::optional<std::string> lastModified;  // "StorebagLastModified"
-  bool attempted = false;                   // a first attempt has ended
-  bool recalled = false;                    // what an earlier daemon kept was looked at
-  bool beingFetched = false;                // requests for this name wait and look again
+  // The section that was obtained last. Failures do not remove it.
+  std::shared_ptr<const config::StorebagSection> data;
+  std::optional<std::string> version;
+  // When the last attempt ended, in seconds since 1970.
+  double fetchTime = 0;
+  bool fetchSuccessful = false;
+  // In seconds.
+  std::int32_t maxAge = 0;
+  std::optional<std::string> lastModified;
+  // A first attempt has ended.
+  bool attempted = false;
+  // What an earlier daemon has kept was looked at.
+  bool recalled = false;
+  // Requests for this name wait.
+  bool beingFetched = false;
 };
 
 enum class CacheVerdict { serve, wait, fetch };
-// Whether a record serves at this time: fresh; failed less than 900 s ago; or neither. The age is absolute,
-// so a clock that was set back makes a record old, too.
+// Serve a fresh record; wait if the last attempt failed less than 900 s ago; otherwise fetch. The age is
+// absolute, so a record also becomes old if the clock is set back.
 CacheVerdict verdictOfRecord(const StorebagRecord& record, double now);
 
 inline constexpr int kSecondsBetweenAttempts = 900;
@@ -48,19 +46,20 @@ class StorebagCache {
   StorebagCache(config::StorebagSource& source, const platform::Clock& clock)
       : _source(source), _clock(clock) {}
 
-  // The section for the client type, or null. May wait for an exchange with the server, its own or another's
-  // for the same name, without the lock.
+  // The section for the client type, or null. May wait for a download for the same name, without the lock.
   std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
+  // By name; a record being fetched is as its last attempt left it.
+  std::map<std::string, StorebagRecord> records();
 
  private:
-  // At the first use of a name: the record as an earlier daemon has kept it.
+  // Called at the first use of a name: takes over what an earlier daemon has kept of it.
   void recall(std::int32_t clientType, const std::string& name);
-  // Nobody fetches it any more.
+  // Called when the fetch of a record has ended.
   void settle(StorebagRecord& record) REQUIRES(_lock);
-  // The record of this name, once nobody fetches it.
+  // Waits until the record of this name is not being fetched.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
-  // What the session gets.
+  // Takes an answer into the record and returns what the session gets.
   std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,
                                                        config::StorebagSectionAnswer answer) REQUIRES(_lock);
 

@@ -1,4 +1,4 @@
-// Acceptance and invalidation of connections; which collection answers what.
+// Accepts and removes connections.
 #include "daemon/veltrad_agent.h"
 
 #include <fmt/format.h>
@@ -41,7 +41,7 @@ bool VeltradAgent::listener(ipc::Listener&, const std::shared_ptr<ipc::Connectio
 
 void VeltradAgent::sessionInvalidated(const std::shared_ptr<session::VeltradSession>& session) {
   logDebug("listener: Vopex connection to %s was invalidated", session->description().c_str());
-  _sessionList.remove(session);
+  _sessionList.remove(*session);
   _families.leave(session->aggregation());
 }
 

@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <atomic>
+#include <chrono>
 #include <future>
 #include <new>
 #include <system_error>
@@ -69,6 +70,7 @@ struct CurlHTTPClient::Impl {
   void endExpired();
   void end(Transfers one, HTTPResult result);
   void complete(Transfers one, HTTPResult result);
+  void record(const std::string& host, const HTTPResult& result);
   void keep(Easy easy);
 
   HTTPQueue queue;
@@ -77,6 +79,7 @@ struct CurlHTTPClient::Impl {
   Connections connections;           // outlives the two that use it
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
+  ServerRecords records;
 
   // HTTP thread only
   std::vector<Easy> idleHandles;  // their set-up costs more than a reset
@@ -233,12 +236,22 @@ void CurlHTTPClient::Impl::end(Transfers one, HTTPResult result) {
 
 void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
   try {
+    record(one.front().host(), result);
     one.front().complete(std::move(result));
   } catch (const std::bad_alloc&) {
     logError("An answer could not be handled: out of memory");
   }
   one.clear();
   queue.completed();
+}
+
+// What this end could not begin, or gave up, says nothing of the server.
+void CurlHTTPClient::Impl::record(const std::string& host, const HTTPResult& result) {
+  const bool own = !result && (result.error().kind == HTTPError::Kind::shortage ||
+                               result.error().kind == HTTPError::Kind::stopping);
+  if (own) return;
+  const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
+  records.ended(host, result && result.value().status < 400, now.count());
 }
 
 void CurlHTTPClient::Impl::keep(Easy easy) {
@@ -289,6 +302,10 @@ bool CurlHTTPClient::passesEmptyTask(std::chrono::milliseconds within) {
   const auto deadline = std::chrono::steady_clock::now() + within;
   const std::future<void> passed = _impl->queue.addEmptyTask();
   return !_impl->wake() || passed.wait_until(deadline) == std::future_status::ready;
+}
+
+std::vector<ServerRecord> CurlHTTPClient::servers() const {
+  return _impl->records.all();
 }
 
 std::size_t CurlHTTPClient::underWay() const {

@@ -13,6 +13,7 @@
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
+#include "http/server_records.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::http {
@@ -117,6 +118,8 @@ class CurlHTTPClient final : public HTTPClient {
   bool passesEmptyTask(std::chrono::milliseconds within);
   // Event posts that have neither completed nor failed.
   std::size_t underWay() const;
+  // By address.
+  std::vector<ServerRecord> servers() const;
 
  private:
   struct Impl;

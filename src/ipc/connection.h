@@ -17,6 +17,7 @@ class MemoryAccount;
 namespace veltrad::ipc {
 
 class Listener;
+class Observer;
 
 // Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's
 // own thread reads frames and runs calls and handlers, one at a time. sendEvent: any thread.
@@ -28,7 +29,10 @@ class Connection {
   // Whom what is kept for this client is charged to; null: nobody.
   virtual std::shared_ptr<platform::MemoryAccount> memoryAccount() const = 0;
   virtual std::optional<Value> valueForEntitlement(std::string_view name) = 0;
+  virtual unsigned uid() const = 0;
   virtual void setExportedObject(std::shared_ptr<wire::ClientSessionInterface> session) = 0;
+  // Instead of a session: of a connection to the control socket.
+  virtual void setObserver(std::shared_ptr<Observer> observer) = 0;
   // A frame of whole length that held no readable call; the connection goes on.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
   // Once, when the connection has ended; released afterwards. The session's end() follows it.

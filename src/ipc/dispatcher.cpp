@@ -245,31 +245,48 @@ Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMe
   }
 }
 
-Refusal runCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
-                const std::string& extensionToken, const std::shared_ptr<PendingReply>& pending,
-                CallMemory& memory) {
+struct Decoded {
+  Dictionary body;
+  const std::string* name;  // in the body, which does not move with its owner
+  Dictionary arguments;
+};
+
+Result<Decoded, std::string> decode(const wire::Frame& frame, CallMemory& memory) {
   const wire::FrameKind kind = frame.header.kind;
   const bool large = kind == wire::FrameKind::largeCall;
   if (kind != wire::FrameKind::call && !large) {
-    return fmt::format(
+    return Failure{fmt::format(
         "after its hello a client sends frames of kind 2 (call) and 6 (large call), not of kind {}",
-        static_cast<unsigned>(kind));
+        static_cast<unsigned>(kind))};
   }
   auto decoded = large ? decodeLargeCall(frame, memory) : decodeCall(frame, memory);
-  if (!decoded) return decoded.error();
+  if (!decoded) return Failure{std::move(decoded.error())};
   Dictionary& body = decoded.value();
-  const std::string* name = body.string(key::kOperation);
-  if (!name) return "\"op\" must be a text";
-  const Operation* operation = operationNamed(*name);
-  if (!operation) return fmt::format("unknown operation \"{}\"", shortened(*name));
-  if (large && operation->name != operation::kUploadLogData) {
-    return fmt::format("a large call is for \"{}\" alone, not for \"{}\"", operation::kUploadLogData, *name);
-  }
   auto given = body.take(key::kArguments);
+  const std::string* name = body.string(key::kOperation);
+  if (!name) return Failure{std::string("\"op\" must be a text")};
+  if (large && *name != operation::kUploadLogData) {
+    return Failure{fmt::format("a large call is for \"{}\" alone, not for \"{}\"", operation::kUploadLogData,
+                               shortened(*name))};
+  }
   auto arguments = given ? std::move(*given).takeDictionary() : std::nullopt;
   if (!arguments) arguments.emplace();
-  Call call{session, *arguments, extensionToken, pending};
-  return operation->run(call);
+  return Decoded{std::move(body), name, std::move(*arguments)};
+}
+
+// Runs `run` on the call that the frame holds; a call that cannot be read gets an error.
+template <typename Run>
+Refusal dispatch(const wire::Frame& frame, const std::shared_ptr<OutQueue>& out, CallMemory& memory,
+                 Run run) {
+  std::shared_ptr<PendingReply> pending;
+  if (frame.header.callID != 0) pending = std::make_shared<PendingReply>(out, frame.header.callID);
+  auto decoded = decode(frame, memory);
+  Refusal refusal = decoded ? run(decoded.value(), pending) : Refusal(std::move(decoded.error()));
+  if (refusal && pending) {
+    const char* what = memory.usedUp ? "The call was not run" : "The call cannot be read";
+    pending->fail(wire::makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));
+  }
+  return memory.usedUp ? std::nullopt : refusal;
 }
 
 }  // namespace
@@ -283,14 +300,24 @@ Result<Dictionary, std::string> decodeFrameBody(const wire::Frame& frame) {
 std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken) {
-  std::shared_ptr<PendingReply> pending;
-  if (frame.header.callID != 0) pending = std::make_shared<PendingReply>(out, frame.header.callID);
-  Refusal refusal = runCall(frame, session, extensionToken, pending, memory);
-  if (refusal && pending) {
-    const char* what = memory.usedUp ? "The call was not run" : "The call cannot be read";
-    pending->fail(wire::makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));
-  }
-  return memory.usedUp ? std::nullopt : refusal;
+  return dispatch(frame, out, memory,
+                  [&](Decoded& call, const std::shared_ptr<PendingReply>& pending) -> Refusal {
+                    const Operation* operation = operationNamed(*call.name);
+                    if (!operation) return unknownOperation(*call.name);
+                    Call running{session, call.arguments, extensionToken, pending};
+                    return operation->run(running);
+                  });
+}
+
+std::optional<std::string> dispatchQuestion(const wire::Frame& frame, Observer& observer,
+                                            const std::shared_ptr<OutQueue>& out, CallMemory& memory) {
+  return dispatch(frame, out, memory, [&](Decoded& call, const std::shared_ptr<PendingReply>& pending) {
+    return observer.ask(*call.name, std::move(call.arguments), pending);
+  });
+}
+
+std::string unknownOperation(std::string_view name) {
+  return fmt::format("unknown operation \"{}\"", shortened(name));
 }
 
 }  // namespace veltrad::ipc

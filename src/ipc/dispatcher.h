@@ -8,6 +8,7 @@
 #include <string>
 
 #include "base/result.h"
+#include "ipc/observer.h"
 #include "ipc/out_queue.h"
 #include "platform/memory_budget.h"
 #include "wire/client_session_interface.h"
@@ -34,6 +35,13 @@ struct CallMemory {
 std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken = {});
+
+// The same for a call on the control socket, which `observer` answers.
+std::optional<std::string> dispatchQuestion(const wire::Frame& frame, Observer& observer,
+                                            const std::shared_ptr<OutQueue>& out, CallMemory& memory);
+
+// What is wrong with a call of this name.
+std::string unknownOperation(std::string_view name);
 
 // The dictionary in the body of a frame that is no call, or what is wrong with it.
 Result<Dictionary, std::string> decodeFrameBody(const wire::Frame& frame);

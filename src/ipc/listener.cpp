@@ -14,7 +14,6 @@
 #include "ipc/peer.h"
 #include "ipc/socket_connection.h"
 #include "platform/log.h"
-#include "wire/constants.h"
 
 namespace veltrad::ipc {
 
@@ -57,6 +56,8 @@ Listener::Listener(ListenerOptions options, ListenerDelegate& delegate)
       _entitlementsPath(std::move(options.entitlementsPath)),
       _mostConnections(options.mostConnections),
       _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
+      _connectionsForOwner(options.connectionsForOwner),
+      _entitlement(std::move(options.entitlement)),
       _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
       _socket(std::move(options.socket)),
       _spare(openSpare()) {}
@@ -169,7 +170,7 @@ bool Listener::acceptOne(std::vector<Arrived>& arrived) {
 // What can be said without looking up anything but the credentials.
 std::string Listener::refusalOf(const Peer& peer) {
   if (auto bound = boundReached(peer.uid)) return std::move(*bound);
-  if (_entitlements.mayHold(wire::kVeltraEntitlement, peer.uid)) return {};
+  if (_entitlement.empty() || _entitlements.mayHold(_entitlement, peer.uid)) return {};
   _counters.count(wire::Reason::not_entitled);
   logDebug(
       "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
@@ -228,7 +229,7 @@ std::optional<std::string> Listener::boundReached(unsigned uid) {
   bool all = false;
   {
     Lock lock(_mutex);
-    all = _clients.size() >= _mostConnections;
+    all = _clients.size() >= _mostConnections - (isOwner(uid) ? 0 : _connectionsForOwner);
     const auto mine = _clientsOfUser.find(uid);
     if (!all && (mine == _clientsOfUser.end() || mine->second < _mostConnectionsOfOneUser))
       return std::nullopt;
@@ -236,7 +237,7 @@ std::optional<std::string> Listener::boundReached(unsigned uid) {
   if (all) {
     _counters.count(wire::Reason::too_many_connections);
     return fmt::format("Connection refused: {} connections are open, and no more are taken.",
-                       _mostConnections);
+                       _mostConnections - _connectionsForOwner);
   }
   _counters.count(wire::Reason::too_many_of_user);
   return fmt::format("Connection refused: uid {} has {} connections open, and no more are taken of one user.",
@@ -256,6 +257,11 @@ bool Listener::startClient(std::uint64_t number, unsigned uid,
   });
   if (!started) forget(number);
   return started;
+}
+
+std::size_t Listener::connectionCount() {
+  Lock lock(_mutex);
+  return _clients.size();
 }
 
 void Listener::reap() {

@@ -17,6 +17,7 @@
 #include "platform/counters.h"
 #include "platform/lent_files.h"
 #include "platform/memory_budget.h"
+#include "wire/constants.h"
 
 namespace veltrad::ipc {
 
@@ -31,6 +32,10 @@ struct ListenerOptions {
   std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
   std::size_t mostConnections = 4096;
   std::size_t mostConnectionsOfOneUser = 1024;
+  // Of them, those that root and the daemon's own user alone may have.
+  std::size_t connectionsForOwner = 0;
+  // What a peer must hold to get a connection; empty: the delegate asks at each call.
+  std::string entitlement = wire::kVeltraEntitlement;
 };
 
 // Job: every client that connects gets a Connection, on which the delegate decides on that connection's own
@@ -38,7 +43,7 @@ struct ListenerOptions {
 // and the counters outlive it. resume() and invalidate() belong to the thread that made it, which is never a
 // connection's own.
 //
-// Its 20 fields are what each connection is given and the bounds, what accepting needs, and the connections
+// Its 22 fields are what each connection is given and the bounds, what accepting needs, and the connections
 // that it must find again when it stops.
 class Listener {
  public:
@@ -57,6 +62,10 @@ class Listener {
   // is the number of connections whose call is still running; their threads are joined by the destructor.
   // Twice does nothing new.
   std::size_t invalidate(std::chrono::steady_clock::time_point deadline);
+
+  // Any thread.
+  std::size_t connectionCount();
+  std::size_t mostConnections() const { return _mostConnections; }
 
  private:
   struct Client {
@@ -94,6 +103,8 @@ class Listener {
   const std::string _entitlementsPath;
   const std::size_t _mostConnections;
   const std::size_t _mostConnectionsOfOneUser;
+  const std::size_t _connectionsForOwner;
+  const std::string _entitlement;
   const FileDescriptor _wakeUp;
 
   // The accepting thread's while it runs, else the owner's.

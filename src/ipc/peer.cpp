@@ -113,6 +113,10 @@ bool endsWith(std::string_view text, std::string_view end) {
 
 }  // namespace
 
+bool isOwner(unsigned uid) {
+  return uid == 0 || uid == ::geteuid();
+}
+
 Result<Peer, std::string> credentialsOfSocket(int socket) {
   ucred credentials{};
   socklen_t length = sizeof credentials;

@@ -22,6 +22,8 @@ struct Peer {
 Result<Peer, std::string> credentialsOfSocket(int socket);
 // All of it. Fails also where the unit cannot be asked for just now, for want of a descriptor.
 Result<Peer, std::string> peerOfSocket(int socket);
+// Root, and the user that the daemon runs as, who may read and change its files anyway.
+bool isOwner(unsigned uid);
 // False only on kernels that cannot say which unit a peer belongs to.
 bool kernelTellsUnits();
 // The unit in a control group path ("/system.slice/x.service"); exposed for its table of tests.

@@ -48,24 +48,6 @@ Result<FileDescriptor, std::string> takeLock(const std::string& path) {
   return lock;
 }
 
-int socketOption(int socket, int option) {
-  int value = -1;
-  socklen_t size = sizeof value;
-  return ::getsockopt(socket, SOL_SOCKET, option, &value, &size) == 0 ? value : -1;
-}
-
-// Absent: usable.
-std::optional<std::string> faultOfHandedOver(int socket) {
-  if (socketOption(socket, SO_DOMAIN) != AF_UNIX || socketOption(socket, SO_TYPE) != SOCK_STREAM) {
-    return fmt::format("The descriptor {} that was handed over is no Unix stream socket.", socket);
-  }
-  if (socketOption(socket, SO_ACCEPTCONN) != 1) {
-    return fmt::format("The socket {} that was handed over does not listen.", socket);
-  }
-  ::fcntl(socket, F_SETFD, FD_CLOEXEC);
-  return std::nullopt;
-}
-
 // Absent: nothing stands at the path any more. Only the holder of the lock calls it.
 std::optional<std::string> removeStale(const std::string& path) {
   struct stat found {};
@@ -108,6 +90,17 @@ Result<FileDescriptor, std::string> listenAt(const std::string& path, struct sta
   return socket;
 }
 
+// `handedOver` as it is, else one that is made at `path`.
+Result<ServiceSocket, std::string> openAt(const std::string& path, std::optional<int> handedOver,
+                                          FileDescriptor lock) {
+  if (handedOver) return ServiceSocket(FileDescriptor(*handedOver), std::move(lock), std::nullopt);
+  struct stat made {};
+  auto socket = listenAt(path, made);
+  if (!socket) return Failure{socket.error()};
+  return ServiceSocket(std::move(socket.value()), std::move(lock),
+                       ServiceSocket::Made{path, made.st_dev, made.st_ino});
+}
+
 }  // namespace
 
 void ServiceSocket::close() {
@@ -122,18 +115,14 @@ void ServiceSocket::close() {
 
 Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
                                                      std::optional<int> handedOver) {
-  FileDescriptor given(handedOver.value_or(-1));
-  if (handedOver) {
-    if (auto fault = faultOfHandedOver(*handedOver)) return Failure{std::move(*fault)};
-  }
   auto lock = takeLock(root.lockPath());
   if (!lock) return Failure{lock.error()};
-  if (handedOver) return ServiceSocket(std::move(given), std::move(lock.value()), std::nullopt);
-  struct stat made {};
-  auto socket = listenAt(root.socketPath(), made);
-  if (!socket) return Failure{socket.error()};
-  return ServiceSocket(std::move(socket.value()), std::move(lock.value()),
-                       ServiceSocket::Made{root.socketPath(), made.st_dev, made.st_ino});
+  return openAt(root.socketPath(), handedOver, std::move(lock.value()));
+}
+
+Result<ServiceSocket, std::string> openControlSocket(const platform::Root& root,
+                                                     std::optional<int> handedOver) {
+  return openAt(root.controlSocketPath(), handedOver, {});
 }
 
 }  // namespace veltrad::ipc

@@ -1,4 +1,4 @@
-// The socket on which clients reach the daemon, and the lock that says which process is the daemon. Made and
+// The sockets on which the daemon is reached, and the lock that says which process is the daemon. Made and
 // used by one thread at a time.
 #pragma once
 
@@ -13,7 +13,7 @@
 
 namespace veltrad::ipc {
 
-// A listening Unix stream socket. The lock on run/veltrad/lock is held as long as the object lives.
+// A listening Unix stream socket. With a lock, run/veltrad/lock is held as long as the object lives.
 class ServiceSocket {
  public:
   // The socket's file, where this process made it: as it was then.
@@ -45,6 +45,10 @@ class ServiceSocket {
 // at most. The run directory must be there. The error is one line that names what is in the way and what to
 // do.
 Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
+                                                     std::optional<int> handedOver);
+
+// The same for run/veltrad/control.sock, whose process holds the lock already.
+Result<ServiceSocket, std::string> openControlSocket(const platform::Root& root,
                                                      std::optional<int> handedOver);
 
 }  // namespace veltrad::ipc

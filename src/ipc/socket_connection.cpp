@@ -60,8 +60,9 @@ std::optional<std::string> SocketConnection::sendEvent(std::string_view frame) {
 }
 
 void SocketConnection::run() {
-  // A delegate that accepted without resume() or without a session has nothing that could serve the client.
-  if (_resumed && _session) serve();
+  // A delegate that accepted without resume(), a session or an observer has nothing that could serve the
+  // client.
+  if (_resumed && (_session || _observer)) serve();
   end();
 }
 
@@ -202,7 +203,8 @@ std::optional<std::string> SocketConnection::dispatch(const wire::Frame& frame,
   const bool large = frame.header.kind == wire::FrameKind::largeCall;
   CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters,
                     [this] { return overdue(); }};
-  auto refusal = dispatchCall(frame, *_session, _out, memory, extensionToken);
+  auto refusal = _observer ? dispatchQuestion(frame, *_observer, _out, memory)
+                           : dispatchCall(frame, *_session, _out, memory, extensionToken);
   if (large) _reader.rest();  // its buffer is part of what the call was charged
   return refusal;
 }
@@ -248,6 +250,7 @@ bool SocketConnection::endWith(wire::Reason counted, const std::string& descript
 void SocketConnection::end() {
   if (const auto handler = std::exchange(_invalidationHandler, nullptr)) handler();
   _interruptionHandler = nullptr;
+  _observer.reset();
   if (const auto session = std::exchange(_session, nullptr)) session->end();
   writeRest();
   _out->close();

@@ -9,6 +9,7 @@
 
 #include "ipc/connection.h"
 #include "ipc/entitlements.h"
+#include "ipc/observer.h"
 #include "ipc/out_queue.h"
 #include "ipc/peer.h"
 #include "ipc/socket_reader.h"
@@ -22,7 +23,7 @@ namespace veltrad::ipc {
 // and sendEvent() may be called by any thread. Entitlements, lent files and
 // counters outlive it. A session and its connection hold each other until run() returns.
 //
-// Its 17 fields are the services that a call may need, what the delegate has set, and how far the
+// Its 18 fields are the services that a call may need, what the delegate has set, and how far the
 // conversation has come.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
@@ -47,9 +48,11 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   std::string description() const override { return _description; }
   std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return _account; }
   std::optional<Value> valueForEntitlement(std::string_view name) override;
+  unsigned uid() const override { return _peer.uid; }
   void setExportedObject(std::shared_ptr<wire::ClientSessionInterface> session) override {
     _session = std::move(session);
   }
+  void setObserver(std::shared_ptr<Observer> observer) override { _observer = std::move(observer); }
   void setInterruptionHandler(std::function<void()> handler) override {
     _interruptionHandler = std::move(handler);
   }
@@ -90,6 +93,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   // Own thread only.
   SocketReader _reader;
   std::shared_ptr<wire::ClientSessionInterface> _session;
+  std::shared_ptr<Observer> _observer;  // instead of a session
   std::function<void()> _interruptionHandler;
   std::function<void()> _invalidationHandler;
   bool _resumed = false;

@@ -9,7 +9,7 @@
 
 namespace veltrad::platform {
 
-std::uint64_t Counters::sum() const {
+std::uint64_t Counters::total() const {
   std::uint64_t sum = 0;
   for (const auto& count : _counts) sum += count.load(std::memory_order_relaxed);
   return sum;

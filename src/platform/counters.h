@@ -22,8 +22,10 @@ class Counters {
   std::uint64_t value(wire::Reason reason) const {
     return _counts[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
   }
+  // Of all counts.
+  std::uint64_t total() const;
   // Since the last time that they were written.
-  bool changed() const { return sum() != _sumWritten.load(std::memory_order_relaxed); }
+  bool changed() const { return total() != _sumWritten.load(std::memory_order_relaxed); }
 
   // Replaces the file (mode 0644) when something changed since the last time; where that fails, it is tried
   // again at the next call, with one error line for an episode. One thread at a time; counters_file.h.
@@ -31,8 +33,6 @@ class Counters {
 
  private:
   static constexpr std::uint64_t kNever = UINT64_MAX;
-
-  std::uint64_t sum() const;
 
   std::array<std::atomic<std::uint64_t>, wire::kReasonCount> _counts{};
   // Counts only grow, so that an equal sum means the same counts.

@@ -22,4 +22,8 @@ std::string Root::socketPath() const {
   return wire::socketPathUnder(_directory);
 }
 
+std::string Root::controlSocketPath() const {
+  return wire::controlSocketPathUnder(_directory);
+}
+
 }  // namespace veltrad::platform

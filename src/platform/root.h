@@ -19,12 +19,15 @@ class Root {
 
   std::string runDirectory() const { return path("run/veltrad"); }
   std::string socketPath() const;
+  // Where those who look after the device ask; beside the service's socket.
+  std::string controlSocketPath() const;
   std::string lockPath() const { return path("run/veltrad/lock"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }
+  std::string metricsPath() const { return path("run/veltrad/metrics.prom"); }
   std::string preferencesDirectory() const { return path("var/lib/veltrad/preferences"); }
   std::string logsDirectory() const { return path("var/log/veltrad"); }
   std::string energyLogPath() const { return path("var/log/veltrad/energy.jsonl"); }

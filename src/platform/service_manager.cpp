@@ -1,13 +1,31 @@
 // libsystemd's notifications and handed-over sockets. Any thread.
 #include "platform/service_manager.h"
 
+#include <fmt/format.h>
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <systemd/sd-daemon.h>
 
 #include <algorithm>
+#include <cstddef>
 #include <system_error>
 
 namespace veltrad::platform {
+
+namespace {
+
+// Of a Unix socket: its path, or what follows the zero byte of an abstract one.
+std::string nameOf(int socket) {
+  sockaddr_un address{};
+  socklen_t size = sizeof address;
+  if (::getsockname(socket, reinterpret_cast<sockaddr*>(&address), &size) != 0) return {};
+  const std::size_t begin = offsetof(sockaddr_un, sun_path);
+  std::string name(address.sun_path, size > begin ? size - begin : 0);
+  while (!name.empty() && name.back() == '\0') name.pop_back();
+  return name;
+}
+
+}  // namespace
 
 void ServiceManager::ready() {
   ::sd_notify(0, "READY=1");
@@ -34,16 +52,23 @@ std::optional<std::chrono::milliseconds> ServiceManager::watchdogInterval() cons
   return std::max(std::chrono::milliseconds(microseconds / 2'000), std::chrono::milliseconds(1));
 }
 
-Result<std::optional<int>, std::string> ServiceManager::handedOverSocket() {
+Result<HandedOver, std::string> ServiceManager::handedOverSockets() {
   const int count = ::sd_listen_fds(1);  // takes the variables out of the environment; close-on-exec
   if (count < 0) return Failure{"the handed-over sockets: " + std::generic_category().message(-count)};
-  if (count == 0) return std::optional<int>();
-  if (count > 1) return Failure{"expected one handed-over socket, got " + std::to_string(count)};
-  const int socket = SD_LISTEN_FDS_START;
-  if (::sd_is_socket(socket, AF_UNIX, SOCK_STREAM, 1) <= 0) {
-    return Failure{std::string("the handed-over descriptor is no listening Unix stream socket")};
+  HandedOver sockets;
+  for (int socket = SD_LISTEN_FDS_START; socket < SD_LISTEN_FDS_START + count; ++socket) {
+    if (::sd_is_socket(socket, AF_UNIX, SOCK_STREAM, 1) <= 0) {
+      return Failure{fmt::format("the handed-over descriptor {} is no listening Unix stream socket", socket)};
+    }
+    const bool control = nameOf(socket).ends_with("control.sock");
+    std::optional<int>& place = control ? sockets.control : sockets.service;
+    if (place) {
+      return Failure{fmt::format("expected one handed-over {} socket, got another one with descriptor {}",
+                                 control ? "control" : "service", socket)};
+    }
+    place = socket;
   }
-  return std::optional(socket);
+  return sockets;
 }
 
 }  // namespace veltrad::platform

@@ -9,6 +9,13 @@
 
 namespace veltrad::platform {
 
+// Descriptors, told apart by the names that they are bound to: one that ends in "control.sock" is the control
+// socket. Each that did not come is absent.
+struct HandedOver {
+  std::optional<int> service;
+  std::optional<int> control;
+};
+
 class ServiceManager {
  public:
   // Without NOTIFY_SOCKET in the environment every notification does nothing.
@@ -18,9 +25,9 @@ class ServiceManager {
   void feedWatchdog();
   // Half of WATCHDOG_USEC; absent when no watchdog is wanted of this process.
   std::optional<std::chrono::milliseconds> watchdogInterval() const;
-  // The one listening Unix stream socket that was handed over (socket activation), made close-on-exec, or
-  // nothing. More than one, or one of another kind, is an error that says what came.
-  Result<std::optional<int>, std::string> handedOverSocket();
+  // The listening Unix stream sockets that were handed over (socket activation), made close-on-exec. A second
+  // one of the same name, or one of another kind, is an error that says what came.
+  Result<HandedOver, std::string> handedOverSockets();
 };
 
 }  // namespace veltrad::platform

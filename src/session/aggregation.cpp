@@ -1,15 +1,12 @@
-// Copies on their way to one client.
+// Queues copies for one client.
 #include "session/aggregation.h"
 
 #include "ipc/client_events.h"
-#include "ipc/connection.h"
 #include "platform/log.h"
 
 namespace veltrad::session {
 
 Aggregation::Aggregation(std::shared_ptr<ipc::Connection> connection) : _connection(std::move(connection)) {}
-
-Aggregation::~Aggregation() = default;
 
 void Aggregation::setActive(bool active) {
   const Lock held(_mutex);
@@ -36,7 +33,8 @@ std::optional<std::string> Aggregation::queue(std::string_view frame) {
 }
 
 std::optional<std::string> Aggregation::end() {
-  std::shared_ptr<ipc::Connection> connection;  // may be the last reference: goes after the lock
+  // Possibly the last reference, released after the lock.
+  std::shared_ptr<ipc::Connection> connection;
   const Lock held(_mutex);
   _active.store(false, std::memory_order_relaxed);
   connection.swap(_connection);

@@ -1,14 +1,9 @@
-// Backends made and told what they need to know.
+// Makes the back ends of a session and reads their states.
 #include "session/backend_set.h"
 
 #include <utility>
 
-#include "backends/backend_factory.h"
-#include "config/storebag_content.h"
-#include "platform/clock.h"
 #include "platform/log.h"
-#include "support/device_identity.h"
-#include "support/veltra.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {
@@ -42,11 +37,8 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   const auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : storebag->backends) {
-    const auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared->compType,
-                                                           {making.account, making.oneShot});
-    if (!backend) continue;
-    backend->setFacts(shared);
-    made->emplace(name, backend);
+    auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot);
+    if (backend) made->emplace(name, std::move(backend));
   }
   return made;
 }
@@ -75,10 +67,12 @@ void syncReportingStates(const BackendSet& backends, const BackendSet* parents) 
     if (backend->state() == backends::kBackendHeld) continue;
     const auto at = parents ? parents->find(name) : BackendSet::const_iterator();
     if (!parents || at == parents->end()) {
-      backend->setState(backends::kBackendDisabled);
+      backend->setState({backends::kBackendDisabled, wire::Reason::parent_has_none});
       continue;
     }
-    backend->setState(at->second->state());
+    backends::StateVerdict verdict = at->second->stateVerdict();
+    if (verdict.state == backends::kBackendDisabled) verdict.reason = wire::Reason::parent_state;
+    backend->setState(verdict);
     backend->setSamplingThreshold(at->second->samplingThreshold());
     logDebug("HTTPSPostBackend(syncReportingStates): %s: state and sampling rate updated to %d, %.02f%%",
              backend->name().c_str(), backend->state(), backend->samplingThreshold().value_or(0));

@@ -1,5 +1,4 @@
-// The backends of one session, made from a storebag section. Plain functions; the session's thread, but for
-// what a family does.
+// The back ends of one session, made from a storebag section.
 #pragma once
 
 #include <cstdint>
@@ -9,29 +8,17 @@
 #include <vector>
 
 #include "backends/backend.h"
+#include "backends/backend_factory.h"
 #include "base/value.h"
-
-namespace veltrad::backends {
-class BackendFactory;
-}  // namespace veltrad::backends
-
-namespace veltrad::config {
-struct StorebagSection;
-}  // namespace veltrad::config
-
-namespace veltrad::platform {
-class Clock;
-class MemoryAccount;
-}  // namespace veltrad::platform
-
-namespace veltrad::support {
-class DeviceIdentity;
-class Veltra;
-}  // namespace veltrad::support
+#include "config/storebag_content.h"
+#include "platform/clock.h"
+#include "platform/memory_budget.h"
+#include "support/device_identity.h"
+#include "support/veltra.h"
 
 namespace veltrad::session {
 
-// By name; the order of the names' bytes is the order in which backends are asked.
+// By name. Back ends are called in the order of their names' bytes.
 using BackendSet = std::map<std::string, std::shared_ptr<backends::VeltraBackend>, std::less<>>;
 
 struct BackendMaking {
@@ -43,23 +30,21 @@ struct BackendMaking {
   bool oneShot = false;
 };
 
-// One backend for each entry of the section that the factory knows; an empty set when it knows none. Null,
-// with one error line, without a storebag or without session info. `facts` has the user info, the device's
-// identifier and the session's ID, where it has one; the rest is found out here.
+// Makes a back end for each entry of the section that the factory knows; the set may be empty. Null, after
+// one error line, without a storebag or without session info. The caller sets the user info, the device's
+// identifier and the combined session ID in `facts`; the other facts are set here.
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
 
-// The names of those in state 2 or 3.
+// The names of those that are reporting or held.
 std::vector<std::string> reportingNames(const BackendSet& backends);
 
-// The number that the HTTPS post backend takes from its client entry; 0, a root, also without one. Any
-// thread.
+// The hierarchy number of the HTTPS post back end; 0, which is a root, if there is none. Any thread.
 std::int32_t hierarchyOf(const BackendSet* backends);
 
-// Takes over the states and sampling thresholds of the parent session's back ends, one by one; one in state 3
-// keeps its own, one that the parent lacks is disabled. Any thread, one at a time for all sessions of a
-// family.
+// Copies the states and sampling thresholds from the parent session's back ends. A held back end keeps its
+// own; one that the parent lacks is disabled. Called under the families' lock.
 void syncReportingStates(const BackendSet& backends, const BackendSet* parents);
 
 }  // namespace veltrad::session

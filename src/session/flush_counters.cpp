@@ -1,4 +1,4 @@
-// The counting of flushes.
+// Counts the answers to flushes.
 #include "session/flush_counters.h"
 
 namespace veltrad::session {

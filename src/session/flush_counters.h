@@ -1,4 +1,4 @@
-// Flushes that wait for their backends. Any thread.
+// Flushes that wait for the answers of their back ends. Any thread.
 #pragma once
 
 #include <memory>
@@ -12,18 +12,18 @@
 
 namespace veltrad::session {
 
-// One flush: how many backends are still to answer, and the completion while it is held.
+// How many back ends have not answered yet, and the completion until it is called.
 struct PendingFlush {
   std::size_t pending = 0;
-  wire::FlushReply completion;  // empty once called, or when nobody waits
+  wire::FlushReply completion;
 };
 
-// One lock for the flushes of all sessions; the daemon has one object.
+// One object serves all sessions.
 class FlushCounters {
  public:
   std::shared_ptr<PendingFlush> begin(std::size_t backends, wire::FlushReply completion);
-  // One backend has answered. The completion is called once: at the first error, or with the last answer;
-  // outside the lock.
+  // Called when a back end has answered. Calls the completion without the lock, once: at the first error, or
+  // with the last answer.
   void finished(PendingFlush& flush, const std::optional<std::string>& answer,
                 const std::optional<wire::ReportingError>& error);
 

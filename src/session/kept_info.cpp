@@ -1,4 +1,4 @@
-// A dictionary and its charge, freed together.
+// Keeps a dictionary together with its charge.
 #include "session/kept_info.h"
 
 #include "platform/memory_budget.h"
@@ -12,7 +12,7 @@ struct Kept {
   platform::Charge charge;
 };
 
-// The lists of identities have keys made of these, each kept three times.
+// The families keep three keys that contain these names.
 std::size_t keyBytes(const Dictionary& info) {
   std::size_t bytes = 0;
   for (const char* name : {wire::kVeltraUserInfoClientName, wire::kVeltraUserInfoServiceName}) {

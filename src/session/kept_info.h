@@ -1,16 +1,15 @@
-// What a session is told of itself and keeps. Plain functions; any thread.
+// Keeps the session info and the user info that a client sends.
 #pragma once
 
 #include <memory>
 
-#include "backends/backend.h"
+#include "backends/session_facts.h"
 #include "base/value.h"
 
 namespace veltrad::session {
 
-// The dictionary, charged to `account` (null: to nobody) for as long as anybody holds it, with what is kept
-// of its names elsewhere. Null: the user keeps too much, even without what its batches hold. No lock may be
-// held.
+// Returns the dictionary, charged to `account` (which may be null) as long as it is referenced. Null if the
+// user would keep too much, even without its batches. Called without a lock.
 backends::SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account);
 
 }  // namespace veltrad::session

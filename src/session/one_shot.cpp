@@ -1,10 +1,9 @@
-// One-shot messages.
+// Sends one-shot messages.
 #include "session/one_shot.h"
 
 #include "platform/clock.h"
 #include "platform/log.h"
 #include "support/device_identity.h"
-#include "support/message_log.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {

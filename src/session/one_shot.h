@@ -1,28 +1,25 @@
-// A single message without a started session, through back ends that live for the call. The caller's thread.
+// Sends a single message without a started session, through back ends made for the call.
 #pragma once
 
 #include <cstdint>
-#include <string>
 
 #include "session/backend_set.h"
-
-namespace veltrad::support {
-class MessageLog;
-}  // namespace veltrad::support
+#include "support/message_log.h"
 
 namespace veltrad::session {
 
+// Pointers may be null.
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
-  backends::SharedDictionary userInfo;  // null: none
+  backends::SharedDictionary userInfo;
   const config::StorebagSection* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
-  const Dictionary* payload = nullptr;  // null: none
+  const Dictionary* payload = nullptr;
 };
 
-// Makes the back ends that the storebag names, lets each compute its state, hands each the message with flag
-// 0, logs what they answer, cleans them up. What they still have under way holds its own copies.
+// Makes the back ends that the storebag names, updates their states, sends the message with flag 0 through
+// each, logs their answers and cleans them up. Work that is still under way does not need the message.
 void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog& messageLog,
                                 const OneShotMessage& message);
 

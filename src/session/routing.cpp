@@ -1,10 +1,9 @@
-// Every back end of a session, one after the other.
+// Calls every back end of a session in order.
 #include "session/routing.h"
 
 #include "base/text.h"
 #include "platform/log.h"
 #include "session/flush_counters.h"
-#include "support/message_log.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {
@@ -38,7 +37,7 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
   }
   const auto flush = flushes.begin(backends->size(), std::move(completion));
   for (const auto& [name, backend] : *backends) {
-    // Holds neither the session nor the backend: it may run on the HTTP thread, long after both have gone.
+    // Must not refer to the session or the back end: it may run on the HTTP thread after both have gone.
     backend->flushMessagesWithCompletion(
         [&flushes, &messageLog, flush, key = name, own = backend->name()](
             const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
@@ -60,7 +59,6 @@ bool uploadFile(const BackendSet* backends, const std::string& path, const std::
   } else {
     logError("uploadFileWithURL: File upload failed for %s", path.c_str());
   }
-  // The full text of the file's address.
   messageLog.writeToLogFile("[uploadFileWithURL] Upload %@ for file %@", uploaded ? "succeeded" : "failed",
                             "file://" + percentEncoded(path, "/!$&'()*+,;=:@"));
   return uploaded;

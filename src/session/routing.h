@@ -1,4 +1,4 @@
-// What a session hands to its back ends: messages, flushes, uploads. Plain functions; the session's thread.
+// Passes a session's messages, flushes and uploads to its back ends. The session's thread.
 #pragma once
 
 #include <cstdint>
@@ -6,35 +6,30 @@
 #include <string>
 
 #include "session/backend_set.h"
+#include "support/message_log.h"
 #include "wire/client_session_interface.h"
-
-namespace veltrad::support {
-class MessageLog;
-}  // namespace veltrad::support
 
 namespace veltrad::session {
 
 class FlushCounters;
 
-// A message as the back ends take it.
 struct Message {
-  const Dictionary* payload = nullptr;  // null: none
+  const Dictionary* payload = nullptr;
   platform::TimeValue time;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   std::int32_t flag = 0;
 };
 
-// To every back end, in order; the answer for the client, or none.
+// Sends the message through every back end in order and returns the answer for the client, if there is one.
 std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
                                            support::MessageLog& messageLog);
 
-// `completion` is called once, at the first error or after the last back end has answered; at once where
-// there is no back end. May be empty.
+// Calls `completion`, which may be empty, once: at the first error, or when all back ends have answered.
 void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::MessageLog& messageLog,
                    wire::FlushReply completion);
 
-// Whether a back end uploaded it. No back ends: null.
+// These return whether a back end uploaded the data. `backends` may be null.
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
                 support::MessageLog& messageLog);
 bool uploadLogDataArray(const BackendSet* backends, const Array& logData);

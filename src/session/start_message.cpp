@@ -1,10 +1,5 @@
-// The start message's two forms.
+// Makes the payload of the start message.
 #include "session/start_message.h"
-
-#include "platform/locale.h"
-#include "platform/preferences.h"
-#include "support/device_identity.h"
-#include "support/veltra.h"
 
 namespace veltrad::session {
 

@@ -1,23 +1,17 @@
-// What a session reports of itself at its start. A plain function; any thread.
+// The payload of the message that a session sends at its start.
 #pragma once
 
 #include "base/value.h"
-
-namespace veltrad::platform {
-class Locale;
-class Preferences;
-}  // namespace veltrad::platform
-
-namespace veltrad::support {
-class DeviceIdentity;
-class Veltra;
-}  // namespace veltrad::support
+#include "platform/locale.h"
+#include "platform/preferences.h"
+#include "support/device_identity.h"
+#include "support/veltra.h"
 
 namespace veltrad::session {
 
-// Internal release: "SerialNum", "Version", "Build", "Hardware", "Product" ("Unknown" where there is no
-// value), "ReportVers", "Locale", "AutomaticTimeSet". Every other release: the last two alone. "Locale" is
-// left out where the locale names no country.
+// On internal releases: "SerialNum", "Version", "Build", "Hardware", "Product" ("Unknown" for a missing
+// value), "ReportVers", "Locale" and "AutomaticTimeSet"; on others only the last two. "Locale" is left out if
+// the locale has no country.
 Dictionary startMessagePayload(support::DeviceIdentity& device, const support::Veltra& library,
                                platform::Preferences& preferences, platform::Locale& locale);
 

@@ -1,11 +1,9 @@
-// A session's life and its messages: creation, configuration, start, state queries, routing, the end.
+// Configures and starts a session, sends its messages, answers its queries and ends it.
 #include "session/veltrad_session.h"
 
 #include <fmt/format.h>
 
 #include "base/base64.h"
-#include "ipc/connection.h"
-#include "platform/counters.h"
 #include "platform/log.h"
 #include "platform/uuid.h"
 #include "session/kept_info.h"
@@ -19,7 +17,7 @@
 namespace veltrad::session {
 
 namespace {
-// String equality of the names that make an identity; a name missing on the new side counts as a change.
+// A name that is missing counts as a change.
 bool sameName(const Dictionary& current, const Dictionary& updated, const char* key) {
   const std::string* before = current.string(key);
   const std::string* now = updated.string(key);
@@ -53,14 +51,12 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
 
-VeltradSession::~VeltradSession() = default;
-
 std::string VeltradSession::description() const {
   return fmt::format("<VeltradSession: {}>", fmt::ptr(this));
 }
 
 FamilyFacts VeltradSession::familyFacts() const {
-  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends};
+  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends, _sessionInfo};
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {
@@ -116,7 +112,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
 
 void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", _sessionID);
-  // It may have been out of reach when the client connected.
+  // It may not have been available when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
   backends::SessionFacts facts;
   facts.device.udid = _deviceid;
@@ -126,7 +122,7 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
       createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
                      &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
-  // A second start: what it replaced is let go in order.
+  // Clean up the back ends that a second start has replaced.
   if (made) {
     for (const auto& [name, backend] : *made) backend->cleanup();
   }
@@ -258,7 +254,7 @@ void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
-// Once, not for each message; a root says it too, though nobody looks for its ancestors.
+// Logged once for each user info, also for a root, which has no ancestors.
 void VeltradSession::sayWithoutUserInfo() {
   if (_saidWithoutUserInfo) return;
   _saidWithoutUserInfo = true;
@@ -269,7 +265,7 @@ void VeltradSession::sayWithoutUserInfo() {
 void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category,
                                       std::uint16_t type, const Dictionary* payload) {
   const FamilyPlace place{*_aggregation, _userInfo, hierarchy};
-  // A root has no ancestors, so it needs no look at them and no lock of the families'.
+  // A root has no ancestors, so it does not need the families' lock.
   const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
   if (!toAncestor && !_aggregation->active()) return;
   const std::string copy = aggregatedCopy(_sessionInfo, _userInfo, timestamp, category, type, payload);
@@ -304,7 +300,7 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
     _services.counters.count(wire::Reason::no_identifiers);
-    return;  // the reply is never given, which ends the client's call
+    return;  // without a reply, which ends the client's call
   }
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
   backends::SharedDictionary kept;
@@ -337,7 +333,7 @@ void VeltradSession::end() {
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
   if (const auto line = _aggregation->shutdownSessionAggregation(_sessionID)) logError("%s", line->c_str());
-  // Nobody sends to this client any more: the invalidation has taken the session from its list.
+  // The session has left its family, so no more copies are sent to this client.
   if (const auto line = _aggregation->end()) logError("%s", line->c_str());
   const auto released = std::exchange(_backends, nullptr);
   _sessionInfo = nullptr;

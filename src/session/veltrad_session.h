@@ -1,5 +1,5 @@
-// VeltradSession: the daemon's side of one client connection. Its connection's thread makes every call, and
-// nobody else reaches it: what others need of it, it tells them (FamilyFacts, Aggregation).
+// VeltradSession: the daemon's side of one client connection. Only the connection's thread calls it; it tells
+// others what they need to know about it (FamilyFacts, Aggregation).
 #pragma once
 
 #include <cstdint>
@@ -10,24 +10,15 @@
 
 #include "backends/backend.h"
 #include "base/value.h"
+#include "ipc/connection.h"
 #include "platform/clock.h"
+#include "platform/counters.h"
+#include "platform/locale.h"
+#include "platform/memory_budget.h"
+#include "platform/preferences.h"
 #include "session/backend_set.h"
+#include "support/message_log.h"
 #include "wire/client_session_interface.h"
-
-namespace veltrad::ipc {
-class Connection;
-}  // namespace veltrad::ipc
-
-namespace veltrad::platform {
-class Counters;
-class Locale;
-class MemoryAccount;
-class Preferences;
-}  // namespace veltrad::platform
-
-namespace veltrad::support {
-class MessageLog;
-}  // namespace veltrad::support
 
 namespace veltrad::session {
 
@@ -36,7 +27,7 @@ class FlushCounters;
 class VeltradSessionDelegate;
 struct FamilyFacts;
 
-// What every session uses. Everything outlives the sessions.
+// What every session uses. It outlives the sessions.
 struct SessionServices {
   backends::BackendFactory& factory;
   support::DeviceIdentity& device;
@@ -49,15 +40,14 @@ struct SessionServices {
   support::MessageLog& messageLog;
 };
 
-// The delegate outlives it. Nothing else owns it for long but the agent's list and the connection.
+// The agent's list and the connection own it. The delegate outlives it.
 class VeltradSession final : public wire::ClientSessionInterface {
  public:
   static std::shared_ptr<VeltradSession> initWithSessionDelegate(const SessionServices& services,
                                                                  VeltradSessionDelegate& delegate,
                                                                  std::shared_ptr<ipc::Connection> connection);
-  ~VeltradSession() override;
 
-  // The frameworks are not looked at.
+  // The frameworks are ignored.
   bool setSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                       std::optional<Array> frameworksToCheck, bool hasAggregationBlock) override;
   void startConfigWithCompletionHandler(wire::NamesReply completionHandler) override;
@@ -75,13 +65,13 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void sendMessageWithSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                   std::uint16_t category, std::uint16_t type,
                                   wire::OptionalDictionary payload, wire::StringReply reply) override;
-  // Sends the stop message, flushes, cleans the backends up and lets go of everything.
+  // Sends the stop message, flushes, and cleans up and releases the back ends.
   void end() override;
   std::string description() const override;
 
   std::uint32_t sessionID() const { return _sessionID; }
   const Aggregation& aggregation() const { return *_aggregation; }
-  // Of the session info, for the choice of a storebag; absent when it names none.
+  // From the session info; selects the storebag.
   std::optional<std::int32_t> clientType() const;
 
  private:
@@ -92,11 +82,13 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
   void receivedUserInfo(backends::SharedDictionary userInfo);
-  // What will be kept of it; false: too much, which is said and counted.
+  // Charges the dictionary to the user. False, and counted, if it is too much.
   bool charged(wire::OptionalDictionary given, backends::SharedDictionary& kept);
   void keepUserInfo(backends::SharedDictionary info);
-  // Through the checks to the aggregating client and every backend; the answer for the client, or none.
-  enum class Origin { client, session };  // whose message it is: the session's own are not missed
+  // Messages of the session itself are not counted as lost.
+  enum class Origin { client, session };
+  // These check the message, pass it to the aggregating client and every back end, and return the answer for
+  // the client.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      wire::OptionalDictionary payload,
                                                      Origin origin = Origin::client);
@@ -111,17 +103,19 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // Constant after construction.
   const SessionServices _services;
   VeltradSessionDelegate& _sessionDelegate;
-  const std::string _sessionIDString;                       // base64 of 16 random bytes
-  const std::shared_ptr<platform::MemoryAccount> _account;  // null: nobody pays
+  // Base64 of 16 random bytes.
+  const std::string _sessionIDString;
+  const std::shared_ptr<platform::MemoryAccount> _account;
   const std::shared_ptr<Aggregation> _aggregation;
 
-  // The connection's thread only.
-  char _deviceid[41] = {};            // NUL-terminated; all zero while the device has no identifier
-  bool _saidWithoutUserInfo = false;  // since the user info was last given
+  // NUL-terminated; empty while the device's identifier is unknown.
+  char _deviceid[41] = {};
+  // The line has been logged for the current user info.
+  bool _saidWithoutUserInfo = false;
   std::uint32_t _sessionID = 0;
-  backends::SharedDictionary _sessionInfo;      // null before it was given
-  backends::SharedDictionary _userInfo;         // null: none
-  std::shared_ptr<const BackendSet> _backends;  // null before the start, and where there is no storebag
+  backends::SharedDictionary _sessionInfo;
+  backends::SharedDictionary _userInfo;
+  std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };
 

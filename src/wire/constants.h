@@ -7,6 +7,11 @@ namespace veltrad::wire {
 inline constexpr const char* kVeltraServiceName = "com.florn.veltrad";
 inline constexpr const char* kVeltraEntitlement = "com.florn.private.veltrad";
 
+// What a peer of the control socket must hold; root and the daemon's own user need neither. "control"
+// includes "observe".
+inline constexpr const char* kObserveEntitlement = "com.florn.veltrad.observe";
+inline constexpr const char* kControlEntitlement = "com.florn.veltrad.control";
+
 // Backend names: the keys of a storebag section.
 inline constexpr const char* kVeltraBackendDashboard = "dashboard";
 inline constexpr const char* kVeltraBackendUploadServer = "uploadserver";

@@ -20,6 +20,13 @@ inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:comp
 inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
 }  // namespace operation
 
+// What those who look after the device ask on the control socket.
+namespace question {
+inline constexpr const char* kMetrics = "metrics";
+inline constexpr const char* kSessions = "sessions";
+inline constexpr const char* kStatus = "status";
+}  // namespace question
+
 // What the daemon calls.
 namespace event {
 inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";

@@ -21,4 +21,8 @@ std::string socketPathUnder(std::string root) {
   return pathUnder(std::move(root), "run/veltrad/com.florn.veltrad.sock");
 }
 
+std::string controlSocketPathUnder(std::string root) {
+  return pathUnder(std::move(root), "run/veltrad/control.sock");
+}
+
 }  // namespace veltrad::wire

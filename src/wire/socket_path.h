@@ -11,5 +11,6 @@ std::string rootFromEnvironment();
 // `relative` without a leading slash: pathUnder("/", "etc/veltrad/ca.pem").
 std::string pathUnder(std::string root, std::string_view relative);
 std::string socketPathUnder(std::string root);
+std::string controlSocketPathUnder(std::string root);
 
 }  // namespace veltrad::wire

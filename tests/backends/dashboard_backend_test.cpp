@@ -51,15 +51,18 @@ backends::SharedProfile parsed(const Dictionary& profile) {
 class Dashboard : public ::testing::Test {
  protected:
   std::shared_ptr<backends::VeltraBackend> make(const Dictionary& more = {},
-                                                const backends::BackendOwner& owner = {}) {
+                                                std::shared_ptr<platform::MemoryAccount> account = nullptr) {
     Dictionary profile{{"ip", "127.0.0.1"}, {"port", unsigned{server.port}}};
     profile.merge(more);
-    return configured(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile),
-                                                       "Desktop", 7, owner));
+    backends::SessionFacts facts;
+    facts.account = std::move(account);
+    return configured(
+        world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop",
+                                         std::make_shared<const backends::SessionFacts>(std::move(facts))));
   }
   // A message that nobody acknowledges, and the end of its back end.
-  void sendAndEnd(const backends::BackendOwner& owner) {
-    const auto backend = make({{"reliable", 60'000}}, owner);
+  void sendAndEnd(std::shared_ptr<platform::MemoryAccount> account) {
+    const auto backend = make({{"reliable", 60'000}}, std::move(account));
     backend->sendMessage(nullptr, kTime, 1, 1, 0);
     backend->cleanup();
   }
@@ -139,16 +142,16 @@ TEST_F(Dashboard, SoManyLingerOfAUserAndInAllAndTheOldestEnds) {
   platform::MemoryBudget budget;
   const auto threads = entries("/proc/self/task");
   const auto ended = wire::Reason::too_many_linger;
-  sendAndEnd({});  // nobody's, and the oldest of all: ended last, for want of room in all
+  sendAndEnd(nullptr);  // nobody's, and the oldest of all: ended last, for want of room in all
   const auto descriptors = entries("/proc/self/fd");
-  for (int i = 0; i < 70; ++i) sendAndEnd({budget.accountOf(1)});
+  for (int i = 0; i < 70; ++i) sendAndEnd(budget.accountOf(1));
   EXPECT_EQ(entries("/proc/self/task"), threads + 2);
   EXPECT_EQ(world.counters.value(ended), 6u);
   EXPECT_EQ(entries("/proc/self/fd"), descriptors + 64);
   EXPECT_GT(budget.used(), 64u * 8192);
   EXPECT_LT(budget.used(), 64u * 10'000);
   for (unsigned user = 2; user <= 5; ++user) {
-    for (int i = 0; i < 50; ++i) sendAndEnd({budget.accountOf(user)});
+    for (int i = 0; i < 50; ++i) sendAndEnd(budget.accountOf(user));
   }
   EXPECT_EQ(entries("/proc/self/fd"), descriptors + 255);
   EXPECT_EQ(world.counters.value(ended), 6u + 9);  // 1 + 64 + 4 * 50 = 265
@@ -163,19 +166,20 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   bounds.userKept = 30'000;
   platform::MemoryBudget budget(bounds);
   const auto account = budget.accountOf(1);
-  for (int i = 0; i < 5; ++i) sendAndEnd({account});  // three fit
+  for (int i = 0; i < 5; ++i) sendAndEnd(account);  // three fit
   EXPECT_EQ(world.counters.value(wire::Reason::no_memory_to_linger), 2u);
-  const auto backend = make({{"reliable", 60'000}}, {account});
+  const auto backend = make({{"reliable", 60'000}}, account);
   for (int i = 0; i < 20; ++i) backend->sendMessage(nullptr, kTime, 1, 1, 0);
   EXPECT_GT(world.counters.value(wire::Reason::no_memory_to_await), 5u);
   EXPECT_EQ(world.counters.value(wire::Reason::datagram_sent), 25u);
 
   const FewDescriptors none;
   std::vector<std::shared_ptr<backends::VeltraBackend>> made;
-  for (int i = 0; i < 3; ++i) made.push_back(make({}, {account}));
+  for (int i = 0; i < 3; ++i) made.push_back(make({}, account));
   log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
   const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
-  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop", 7),
+  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop",
+                                             std::make_shared<const backends::SessionFacts>()),
             nullptr);
 }
 

@@ -38,8 +38,10 @@ TEST(SamplingFactors, AreDrawnUnlessChosenOtherwiseAndTheSecretIsThere) {
   backends::SamplingFactors factors(settings, secret);
   services.sampling = &factors;
   backends::BackendFactory factory(services);
+  auto facts = std::make_shared<backends::SessionFacts>();
+  facts->compType = 7;
   const auto factor = [&] {
-    return factory.newBackendWithName("ampery", nullptr, "Elm", 7)->samplingFactor();
+    return factory.newBackendWithName("ampery", nullptr, "Elm", facts, false)->samplingFactor();
   };
   EXPECT_EQ(factor(), world.random.draw);
   EXPECT_FALSE(world.files.bytes(path));

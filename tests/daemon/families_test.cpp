@@ -24,7 +24,9 @@ struct Client final : ipc::Connection {
   std::string description() const override { return "client"; }
   std::shared_ptr<platform::MemoryAccount> memoryAccount() const override { return nullptr; }
   std::optional<Value> valueForEntitlement(std::string_view) override { return std::nullopt; }
+  unsigned uid() const override { return 0; }
   void setExportedObject(std::shared_ptr<wire::ClientSessionInterface>) override {}
+  void setObserver(std::shared_ptr<ipc::Observer>) override {}
   void setInterruptionHandler(std::function<void()>) override {}
   void setInvalidationHandler(std::function<void()>) override {}
   void resume() override {}
@@ -68,7 +70,7 @@ struct Session {
     set->emplace(wire::kVeltraBackendHTTPPost, leading);
     if (!lacks) {
       backend = std::make_shared<Reporting>(wire::kVeltraBackendDashboard, random);
-      backend->setState(state);
+      backend->setState({state, wire::Reason::reports});
       backend->setSamplingThreshold(id[0]);
       backends::SessionFacts facts;
       facts.combinedSessionIDString = id;
@@ -82,7 +84,7 @@ struct Session {
         Dictionary{{wire::kVeltraUserInfoClientName, name}, {wire::kVeltraUserInfoServiceName, "ringer"}});
   }
   session::FamilyFacts facts() const {
-    return {aggregation, static_cast<std::uint32_t>(id[0]), id, userInfo, set};
+    return {aggregation, static_cast<std::uint32_t>(id[0]), id, userInfo, set, nullptr};
   }
   session::FamilyPlace place() const { return {*aggregation, userInfo, session::hierarchyOf(set.get())}; }
   // Combined ID, state, whose threshold, "!" while it aggregates.

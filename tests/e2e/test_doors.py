@@ -80,12 +80,14 @@ class Doors(SystemTest):
         self.root.path = self.root.path.parent
 
     def test_socket_activation_and_service_manager(self):
-        """Descriptor 3 is the listener; the service manager is notified of readiness, of the transaction and of the end."""
+        """Descriptors 3 and 4 are the listeners, told apart by their paths; the service manager is notified of readiness, of
+        the transaction and of the end."""
         os.makedirs(os.path.dirname(self.root.socket))
         notify = str(self.root.path / "notify")
-        wrapper = ("import os, sys; os.dup2(int(sys.argv[1]), 3); os.environ.update(LISTEN_FDS='1', "
-                   "LISTEN_PID=str(os.getpid())); os.execv(sys.argv[2], sys.argv[2:])")
-        with socket.socket(socket.AF_UNIX) as listener, socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager:
+        wrapper = ("import os, sys; [os.dup2(int(n), 20 + i) for i, n in enumerate(sys.argv[1:3])]; "
+                   "os.dup2(20, 3); os.dup2(21, 4); os.environ.update(LISTEN_FDS='2', LISTEN_PID=str(os.getpid())); os.execv(sys.argv[3], sys.argv[3:])")
+        with (socket.socket(socket.AF_UNIX) as listener, socket.socket(socket.AF_UNIX) as control,
+              socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager):
             manager.bind(notify)
             manager.settimeout(DEADLINE)
             told = ""
@@ -95,14 +97,18 @@ class Doors(SystemTest):
                 while word not in told:
                     told += manager.recv(4096).decode() + "\n"
             listener.bind(self.root.socket)
+            control.bind(os.path.dirname(self.root.socket) + "/control.sock")
             listener.listen(5)
-            with self.serving(wrapper=(sys.executable, "-c", wrapper, str(listener.fileno())),
-                              pass_fds=(listener.fileno(),), env={"NOTIFY_SOCKET": notify, "WATCHDOG_USEC": "1000000"}):
+            control.listen(5)
+            handed = (control.fileno(), listener.fileno())
+            with self.serving(wrapper=(sys.executable, "-c", wrapper, *map(str, handed)), pass_fds=handed,
+                              env={"NOTIFY_SOCKET": notify, "WATCHDOG_USEC": "1000000"}):
                 for word in ("READY=1", "WATCHDOG=1"):
                     hears(word)
                 waiting = Wire(self.root)
                 hears("STATUS=")
                 self.assertEqual(self.open()[1], ["httppost"])
+                self.assertIn("veltrad_connections", self.ctl("metrics")[0])
                 waiting.close()
             hears("STOPPING=1")
             self.assertTrue(os.path.exists(self.root.socket))

@@ -1,4 +1,4 @@
-// The energy log's back end. The session's thread.
+// Turns a message into an event of the energy log.
 #include "backends/ampery/ampery_backend.h"
 
 #include "backends/ampery/energy_log.h"

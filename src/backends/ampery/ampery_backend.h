@@ -1,5 +1,5 @@
-// AmperyBackend: every message with a method and a payload is one registered event of the energy log. The
-// session's thread.
+// AmperyBackend: writes every message that has a method and a payload to the energy log. The session's
+// thread.
 #pragma once
 
 #include <memory>
@@ -18,14 +18,13 @@ class AmperyBackend final : public VeltraBackend {
                                                      platform::Random& random, const std::string& name,
                                                      const std::string& productFamily);
 
-  // Nothing, always. The event is the payload, with "method", "respCode" and "event" (the event ID) set.
+  // The event is the payload with "method", "respCode" and "event" (the event ID) set. Returns no text.
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
 
  private:
   AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,
                 const std::string& name, const std::string& productFamily);
 
-  // Constant after construction.
   EnergyLog& _energyLog;
   platform::Counters& _counters;
 };

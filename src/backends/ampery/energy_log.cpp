@@ -1,4 +1,4 @@
-// Events appended to the energy log's file. Any thread; one at a time.
+// Appends events to the energy log's file.
 #include "backends/ampery/energy_log.h"
 
 #include <fcntl.h>
@@ -11,8 +11,6 @@
 
 #include "base/file_descriptor.h"
 #include "formats/json.h"
-#include "platform/clock.h"
-#include "platform/counters.h"
 #include "platform/log.h"
 
 namespace veltrad::backends {
@@ -41,21 +39,21 @@ void EnergyLog::logRegisteredEvent(std::uint32_t client, const std::string& name
 
 std::optional<std::string> EnergyLog::append(std::string_view line) const {
   const auto failed = [&] { return _path + ": " + std::generic_category().message(errno); };
-  // O_NONBLOCK: a pipe under that name must not hold the caller.
+  // O_NONBLOCK: opening a pipe of that name must not block the caller.
   const FileDescriptor file(::open(
       _path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC, 0640));
   if (!file.isOpen()) return failed();
   struct stat status {};
   if (::fstat(file.get(), &status) != 0) return failed();
   if (!S_ISREG(status.st_mode)) return _path + ": not a regular file";
-  // A daemon that was killed may have left the beginning of a line.
+  // A daemon that was killed may have left an incomplete line.
   char last = '\n';
   if (status.st_size > 0 && ::pread(file.get(), &last, 1, status.st_size - 1) < 0) return failed();
   const std::string text = (last == '\n' ? "" : "\n") + std::string(line);
   const ssize_t written = ::write(file.get(), text.data(), text.size());
   if (written < 0) return failed();
   if (written == static_cast<ssize_t>(text.size())) return std::nullopt;
-  // The disk filled up within the line: its beginning must not stand before the next one.
+  // The disk is full: remove the part of the line that was written.
   const off_t end = ::lseek(file.get(), 0, SEEK_CUR);
   if (end < written || ::ftruncate(file.get(), end - written) != 0) return failed();
   return _path + ": no room for " + std::to_string(line.size()) + " bytes";

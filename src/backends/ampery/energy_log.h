@@ -1,4 +1,4 @@
-// The energy log: registered events, one JSON object a line. Any thread.
+// The energy log: registered events, one JSON object per line. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -8,37 +8,34 @@
 
 #include "base/mutex.h"
 #include "base/value.h"
-
-namespace veltrad::platform {
-class Clock;
-class Counters;
-}  // namespace veltrad::platform
+#include "platform/clock.h"
+#include "platform/counters.h"
 
 namespace veltrad::backends {
 
-// A line is {"client": n, "name": text, "time": seconds since 1970, "event": {…}} and goes to the end of the
-// file in one write. The file is opened anew for each line, so that one that was renamed or removed is
-// followed by a new one (mode 0640). A link in its place is not followed.
+// Each line is {"client": n, "name": text, "time": seconds since 1970, "event": {…}}, appended in one write.
+// The file is opened for each line, so a file that was renamed or removed is replaced by a new one (mode
+// 0640). Symbolic links are not followed.
 class EnergyLog {
  public:
-  // Clock and counters outlive it. The directory must be there.
+  // The clock and the counters outlive it. The directory must exist.
   EnergyLog(const platform::Clock& clock, platform::Counters& counters, std::string path)
       : _clock(clock), _counters(counters), _path(std::move(path)) {}
 
-  // An event that cannot be written is lost and counted; one error line for an episode of failures says so.
+  // An event that cannot be written is counted as lost. Consecutive failures make one error line.
   void logRegisteredEvent(std::uint32_t client, const std::string& name, const Dictionary& event);
 
  private:
-  // Nothing, or the failure text.
+  // Returns why it failed, if it did.
   std::optional<std::string> append(std::string_view line) const REQUIRES(_mutex);
 
-  // Constant after construction.
   const platform::Clock& _clock;
   platform::Counters& _counters;
   const std::string _path;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  std::uint64_t _lost GUARDED_BY(_mutex) = 0;  // in this episode
+  // Since the last event that was written.
+  std::uint64_t _lost GUARDED_BY(_mutex) = 0;
 };
 
 }  // namespace veltrad::backends

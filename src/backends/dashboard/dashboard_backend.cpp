@@ -1,4 +1,4 @@
-// The dashboard back end: from a storebag's section to a connected socket, from a message to a datagram.
+// Connects a socket as a storebag's section says, and turns messages into datagrams.
 #include "backends/dashboard/dashboard_backend.h"
 
 #include <endian.h>
@@ -14,7 +14,6 @@
 #include "platform/clock.h"
 #include "platform/counters.h"
 #include "platform/log.h"
-#include "platform/memory_budget.h"
 
 namespace veltrad::backends {
 
@@ -30,7 +29,7 @@ bool namesServer(const config::DashboardProfile& profile) {
   return named;
 }
 
-// One more socket; those that linger for others make room for it.
+// If descriptors are short, ends queues that linger.
 std::optional<UDPSocket> openSocket(DashboardQueues& queues) {
   for (;;) {
     auto socket = UDPSocket::open();
@@ -48,15 +47,14 @@ bool useReliableUDP(UDPSocket& socket) {
   return !failure;
 }
 
-// Where to, and how; the address is missing where its text names none.
+// The address is missing if its text is not an address.
 struct Server {
   std::optional<sockaddr_in> address;
   bool reliable = true;
   std::chrono::milliseconds period = kDefaultPeriod;
 
-  DashboardQueues::Route routeOf(const BackendOwner& owner) const {
-    const auto user = owner.account ? std::int64_t{owner.account->uid()} : DashboardQueues::kNobody;
-    return {address->sin_addr.s_addr, address->sin_port, reliable, period, user};
+  DashboardQueues::Route routeOf(const platform::MemoryAccount* account) const {
+    return {address->sin_addr.s_addr, address->sin_port, reliable, period, DashboardQueues::userOf(account)};
   }
 };
 
@@ -68,7 +66,7 @@ Server serverOf(const config::DashboardProfile* profile, const std::optional<std
           asked > 0 ? std::chrono::milliseconds(asked) : kDefaultPeriod};
 }
 
-// Null: one error line has said why.
+// Null after one error line.
 std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSocket socket,
                                             const Server& server) {
   if (!server.address) {
@@ -86,13 +84,13 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable, making.owner.oneShot, server.period};
+  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period};
   const auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind,
-                                                        making.owner.account, making.queues, making.counters);
+                                                        making.account, making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
     logError("DashboardBackend(useReliableUDP): can't create read source");
   }
-  if (kind.shared) making.queues->share(server.routeOf(making.owner), queue);
+  if (kind.shared) making.queues->share(server.routeOf(making.account.get()), queue);
   return queue;
 }
 }  // namespace
@@ -119,7 +117,7 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
   if (profile && !namesServer(*profile)) return nullptr;
   const Server server = serverOf(profile, serverIP, serverPort);
   auto queue =
-      making.owner.oneShot && server.address ? making.queues->join(server.routeOf(making.owner)) : nullptr;
+      making.oneShot && server.address ? making.queues->join(server.routeOf(making.account.get())) : nullptr;
   auto socket = queue ? std::nullopt : openSocket(*making.queues);
   if (!queue && !socket) return nullptr;
   std::shared_ptr<DashboardBackend> backend(new DashboardBackend(making, name, profile, productFamily));

@@ -1,5 +1,5 @@
-// DashboardBackend: every message is one UDP datagram for a dashboard and one text line for its sender. The
-// session's thread sends and uploads; what waits then is the work pool's (network_proc_queue.h).
+// DashboardBackend: sends every message as one UDP datagram to a dashboard and returns it as a text line. The
+// session's thread sends and uploads; the work pool handles what waits after that (network_proc_queue.h).
 #pragma once
 
 #include <cstdint>
@@ -18,7 +18,7 @@ class DashboardQueues;
 class LogDataUploads;
 class WorkPool;
 
-// What a dashboard back end is made from. What it refers to outlives it.
+// What a dashboard back end uses, and the account that pays for what it keeps. The references outlive it.
 struct DashboardMaking {
   platform::Random& random;
   platform::Clock& clock;
@@ -26,32 +26,33 @@ struct DashboardMaking {
   WorkPool& pool;
   LogDataUploads& uploads;
   std::shared_ptr<DashboardQueues> queues;
-  BackendOwner owner;
+  std::shared_ptr<platform::MemoryAccount> account;
+  bool oneShot = false;
 };
 
-// Null from an initialiser: it cannot work so; one error line has said why.
+// The initialisers return null, after one error line, if the back end cannot work.
 class DashboardBackend final : public VeltraBackend {
  public:
-  // From a storebag's section: "ip" (dotted-decimal IPv4), "port", and where given "display_url", "post_url"
-  // (for log data) and "reliable": present switches acknowledgements on; its value, from 1 on, is the period
-  // of the ticks in milliseconds, else 500.
+  // From a storebag's section: "ip" (dotted-decimal IPv4), "port" and optionally "display_url", "post_url"
+  // (for log data) and "reliable". The presence of "reliable" requests acknowledgements; its value is the
+  // period of the ticks in milliseconds, 500 if it is below 1.
   static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
                                                         const std::string& name,
                                                         const config::DashboardProfile* profile,
                                                         const std::string& productFamily);
-  // To a server named outright, with acknowledgements and a period of 500 ms.
+  // To the given server, with acknowledgements and a period of 500 ms.
   static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
                                                         const std::string& name,
                                                         const std::optional<std::string>& serverIP,
                                                         std::uint16_t serverPort,
                                                         const std::string& productFamily);
-  // A profile goes before the server named.
+  // A profile takes precedence over the given server.
   static std::shared_ptr<DashboardBackend> initWithName(
       const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
       const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
-  // The dashboard text line of the message.
+  // Returns the dashboard text line of the message.
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
@@ -62,13 +63,12 @@ class DashboardBackend final : public VeltraBackend {
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
 
-  // Constant after initialisation.
   LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
   const bool _usingProfile;
   const std::optional<std::string> _postURL;
-  std::shared_ptr<NetworkProcQueue> _networkProcQueue;  // null: not initialised
+  std::shared_ptr<NetworkProcQueue> _networkProcQueue;
 
   // The session's thread only.
   bool _cleanedUp = false;

@@ -1,4 +1,4 @@
-// Who lingers, who has to go, who is found again.
+// Registers, finds and ends queues.
 #include "backends/dashboard/dashboard_queues.h"
 
 #include <algorithm>
@@ -48,7 +48,8 @@ bool DashboardQueues::endOldest() {
   return true;
 }
 
-// And those that have ended. Nothing is held here, or a queue's last holder might be this lock's.
+// Removes the queue, and those that have ended. Takes no reference, because releasing the last one under the
+// lock would destroy a queue there.
 void DashboardQueues::forget(const std::shared_ptr<NetworkProcQueue>& queue) {
   std::erase_if(_lingering, [&queue](const Lingering& one) {
     const bool same = !one.queue.owner_before(queue) && !queue.owner_before(one.queue);

@@ -1,5 +1,5 @@
-// The queues to dashboards that outlive their back ends: how many may linger, and which of them one-shot
-// messages find again. Any thread.
+// The queues to dashboards that outlive their back ends: limits their number, and finds those that one-shot
+// messages share. Any thread.
 #pragma once
 
 #include <netinet/in.h>
@@ -13,20 +13,26 @@
 #include <memory>
 
 #include "base/mutex.h"
+#include "platform/memory_budget.h"
 
 namespace veltrad::backends {
 
 class NetworkProcQueue;
 
-// One for all dashboard back ends. It owns no queue: a queue ends by itself when nothing waits in it, which
-// is noticed here at the next look. No queue's lock is taken under its own.
+// One object serves all dashboard back ends. It does not own the queues: a queue ends when nothing waits in
+// it, which is noticed here at the next call. It calls no queue under its own lock.
 class DashboardQueues {
  public:
   static constexpr std::size_t kMostOfUser = 64;
   static constexpr std::size_t kMost = 256;
-  static constexpr std::int64_t kNobody = -1;  // where no user is known
+  // Stands for an unknown user.
+  static constexpr std::int64_t kNobody = -1;
 
-  // Where one-shot messages of one user go in the same way.
+  static std::int64_t userOf(const platform::MemoryAccount* account) {
+    return account ? std::int64_t{account->uid()} : kNobody;
+  }
+
+  // What one-shot messages that share a queue have in common.
   struct Route {
     in_addr_t address = 0;
     in_port_t port = 0;
@@ -36,15 +42,15 @@ class DashboardQueues {
     auto operator<=>(const Route&) const = default;
   };
 
-  // The queue that one-shot messages on this route share, with one back end more to wait for; null: there is
-  // none.
+  // Returns the queue for one-shot messages on this route, to which one more back end is then connected. Null
+  // if there is none.
   std::shared_ptr<NetworkProcQueue> join(const Route& route);
-  // From now on join() finds it.
+  // From now on join() finds this queue.
   void share(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue);
-  // `queue` waits without a back end. Beyond the bounds the oldest such one of its user is ended, else the
-  // oldest of all.
+  // Registers a queue that waits without a back end. If the user, or all together, have too many such queues,
+  // the oldest one is ended.
   void lingers(const std::shared_ptr<NetworkProcQueue>& queue, std::int64_t user);
-  // For want of a descriptor; false: none lingers.
+  // Frees a descriptor. False if no queue lingers.
   bool endOldest();
 
  private:
@@ -52,13 +58,13 @@ class DashboardQueues {
     std::weak_ptr<NetworkProcQueue> queue;
     std::int64_t user;
   };
-  using List = std::list<Lingering>;
   void forget(const std::shared_ptr<NetworkProcQueue>& queue) REQUIRES(_mutex);
-  // Of `user`'s, where there are too many of them, else of all; null: there is room.
+  // Removes the oldest queue of the user, or of all, if there are too many. Null if there is room.
   std::shared_ptr<NetworkProcQueue> takeOneTooMany(std::int64_t user) REQUIRES(_mutex);
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  List _lingering GUARDED_BY(_mutex);  // oldest first
+  // Oldest first.
+  std::list<Lingering> _lingering GUARDED_BY(_mutex);
   std::map<Route, std::weak_ptr<NetworkProcQueue>> _shared GUARDED_BY(_mutex);
 };
 

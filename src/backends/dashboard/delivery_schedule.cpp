@@ -1,4 +1,4 @@
-// Ticks and the clean-up.
+// Computes ticks and the progress of the clean-up.
 #include "backends/dashboard/delivery_schedule.h"
 
 #include <algorithm>

@@ -1,5 +1,4 @@
-// When a back end's ticks are and when its clean-up ends. On a time that the caller passes; one thread at a
-// time.
+// Computes when a back end's ticks are due and when its clean-up ends. Not thread-safe.
 #pragma once
 
 #include <chrono>
@@ -7,27 +6,26 @@
 
 namespace veltrad::backends {
 
-// Ticks stand at multiples of the period since the back end was made, and are needed only while datagrams
-// wait or a clean-up is under way.
+// Ticks are at multiples of the period since the back end was made. They are needed only while datagrams wait
+// or a clean-up is under way.
 class DeliverySchedule {
  public:
   using Time = std::chrono::steady_clock::time_point;
   enum class Verdict { goOn, stop, lastResortScheduled };
   static constexpr std::chrono::milliseconds kLastResort{9500};
 
-  // `period` is above 0.
+  // `period` is positive.
   DeliverySchedule(Time made, std::chrono::milliseconds period) : _made(made), _period(period) {}
 
-  // When to look again; none: not before a datagram waits.
+  // When the next tick or the last resort is due; nothing if no tick is needed.
   std::optional<Time> next(Time now, bool waiting);
   bool tickIsDue(Time now) const { return _nextTick && *_nextTick <= now; }
   bool lastResortIsDue(Time now) const { return _lastResort && *_lastResort <= now; }
 
-  // The session lets go: stop when nothing waits, else when nothing waits any more.
+  // The session releases the back end, which stops as soon as nothing waits.
   Verdict cleanup(bool waiting);
-  // Somebody sends again: no clean-up is under way any more.
+  // Cancels a clean-up, because something is sent again.
   void resume();
-  // At the end of every tick.
   Verdict afterTick(Time now, bool waiting);
 
  private:

@@ -1,21 +1,19 @@
-// The array's archive, its post, the location that comes back.
+// Archives the array, posts it and returns the location.
 #include "backends/dashboard/log_data_uploads.h"
 
 #include <new>
 
 #include "base/property_list.h"
 #include "base/text.h"
-#include "http/http_client.h"
-#include "platform/counters.h"
 #include "platform/log.h"
 
 namespace veltrad::backends {
 
 namespace {
-// A place is a short text; what is longer is none.
+// A location is much shorter.
 constexpr std::size_t kMostAnswerBytes = 1u << 20;
 
-// Nothing: memory for it is short.
+// Nothing if memory is short.
 std::optional<std::string> archiveOf(const Array& logData) {
   try {
     return writeBinaryPropertyList(logData);

@@ -1,4 +1,4 @@
-// The uploads of log data arrays: each blocks its caller's thread until the server has answered. Any thread.
+// Uploads arrays of log data. Each upload blocks its caller until the server has answered. Any thread.
 #pragma once
 
 #include <optional>
@@ -6,29 +6,23 @@
 
 #include "base/result.h"
 #include "base/value.h"
-
-namespace veltrad::http {
-class HTTPClient;
-}  // namespace veltrad::http
-
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
+#include "http/http_client.h"
+#include "platform/counters.h"
 
 namespace veltrad::backends {
 
-// One for all dashboard back ends, which it outlives. The memory of the array and its archive is charged with
-// the call that brought it.
+// One object serves all dashboard back ends, which it outlives. The memory of the array and its archive is
+// charged with the call that delivered it.
 class LogDataUploads {
  public:
   LogDataUploads(http::HTTPClient& http, platform::Counters& counters) : _http(http), _counters(counters) {}
 
-  // Where the server says that it stored the array, whatever its status; none, after one error line, when it
-  // could not be asked or said nothing.
+  // Returns the location in the server's answer, whatever its status. Nothing, after one error line, if there
+  // is no answer or it is empty.
   std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData);
 
  private:
-  // The answer's body, or why there is none.
+  // Returns the answer's body, or why there is none.
   Result<std::string, std::string> post(const std::string& url, std::string archive);
 
   http::HTTPClient& _http;

@@ -1,4 +1,4 @@
-// Sending, waiting, sending again, giving up.
+// Sends datagrams, again where necessary, and gives them up.
 #include "backends/dashboard/message_queue.h"
 
 #include <algorithm>
@@ -7,11 +7,11 @@
 namespace veltrad::backends {
 
 namespace {
-// Ticks before a retransmission, by the retransmissions done so far.
+// Ticks before a retransmission, indexed by the number of retransmissions so far.
 constexpr int checksBeforeRetransmit[] = {2, 3, 5, 9};
 constexpr int kMostRetransmits = static_cast<int>(std::size(checksBeforeRetransmit));
 static_assert(checksBeforeRetransmit[kMostRetransmits - 1] == SentCopies::kTicks);
-// Five transmissions of each that waits, and as many again of those that have gone.
+// Room for five transmissions of each datagram that waits, and as many of those that no longer do.
 constexpr std::size_t kMostCopies = MessageQueue::maxPendingSharedPackets * 2 * (kMostRetransmits + 1);
 }  // namespace
 
@@ -29,11 +29,9 @@ MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::u
   if (sent && !_reliableUDP) return result;
   if (!charge)
     return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt};
-  auto& record = _pending.emplace_back(datagram, eventNumber, ++_lastSerial, std::move(*charge));
-  if (sent) {
-    record.setState(UDPPacketToSend::awaitsAcknowledgement);
-    if (_copies) _copies->sent(record.serial(), eventNumber);
-  }
+  const auto state = sent ? UDPPacketToSend::awaitsAcknowledgement : UDPPacketToSend::notSent;
+  _pending.push_back({std::string(datagram), eventNumber, ++_lastSerial, std::move(*charge), state});
+  if (sent && _copies) _copies->sent(_lastSerial, eventNumber);
   if (_pending.size() > _most) {
     _pending.pop_front();
     result.pushedOut = _copies ? wire::Reason::shared_datagrams_wait : wire::Reason::datagrams_wait;
@@ -51,46 +49,45 @@ MessageQueue::Tick MessageQueue::tick() {
 }
 
 bool MessageQueue::send(const UDPPacketToSend& record) {
-  if (!_send(record.data())) return false;
-  if (_copies && _reliableUDP) _copies->sent(record.serial(), record.eventNumber());
+  if (!_send(record.data)) return false;
+  if (_copies && _reliableUDP) _copies->sent(record.serial, record.eventNumber);
   return true;
 }
 
 bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
-  if (record.state() == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
+  if (record.state == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
   if (!send(record)) return false;
   ++result.sent;
-  record.setState(UDPPacketToSend::awaitsAcknowledgement);
+  record.state = UDPPacketToSend::awaitsAcknowledgement;
   return !_reliableUDP;
 }
 
 bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
-  const int retransmits = record.numberOfRetransmits();
-  if (retransmits >= kMostRetransmits) {
+  if (record.numberOfRetransmits >= kMostRetransmits) {
     ++result.givenUp;
     return true;
   }
-  const int checks = record.numberOfChecks() + 1;
-  if (checks < checksBeforeRetransmit[retransmits]) {
-    record.setNumberOfChecks(checks);
+  const int checks = record.numberOfChecks + 1;
+  if (checks < checksBeforeRetransmit[record.numberOfRetransmits]) {
+    record.numberOfChecks = checks;
   } else if (send(record)) {
-    record.setNumberOfChecks(0);
-    record.setNumberOfRetransmits(retransmits + 1);
+    record.numberOfChecks = 0;
+    ++record.numberOfRetransmits;
     ++result.sentAgain;
   }
   return false;
 }
 
 std::size_t MessageQueue::notSent() const {
-  return static_cast<std::size_t>(std::count_if(
-      _pending.begin(), _pending.end(),
-      [](const UDPPacketToSend& record) { return record.state() == UDPPacketToSend::notSent; }));
+  return static_cast<std::size_t>(
+      std::count_if(_pending.begin(), _pending.end(),
+                    [](const UDPPacketToSend& record) { return record.state == UDPPacketToSend::notSent; }));
 }
 
 bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
   const auto answered = _copies ? _copies->answered(eventNumber) : std::nullopt;
   const auto record = std::find_if(_pending.begin(), _pending.end(), [&](const UDPPacketToSend& one) {
-    return _copies ? answered == one.serial() : one.eventNumber() == eventNumber;
+    return _copies ? answered == one.serial : one.eventNumber == eventNumber;
   });
   if (record == _pending.end()) return false;
   _pending.erase(record);

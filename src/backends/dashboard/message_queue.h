@@ -1,5 +1,4 @@
-// The datagrams that wait and the rules by which they leave. No time and no socket of its own; one thread at
-// a time.
+// The datagrams that wait, and the rules for sending and removing them. Not thread-safe.
 #pragma once
 
 #include <cstddef>
@@ -16,56 +15,63 @@
 
 namespace veltrad::backends {
 
-// A datagram that could not be sent whole waits for the next tick. With reliable UDP every other one waits
-// for its acknowledgement: unless it comes, the datagram is sent again on the 2nd, 5th, 10th and 19th tick
-// and given up on the 20th.
+// A datagram that could not be sent whole waits for the next tick. With reliable UDP every other datagram
+// waits for its acknowledgement; until that comes, it is sent again on the 2nd, 5th, 10th and 19th tick, and
+// given up on the 20th.
 class MessageQueue {
  public:
-  static constexpr std::size_t maxPendingPackets = 50;          // of one back end
-  static constexpr std::size_t maxPendingSharedPackets = 1024;  // of one-shot messages to one dashboard
-  // True when all bytes went out.
+  // For one back end.
+  static constexpr std::size_t maxPendingPackets = 50;
+  // For all one-shot messages to one dashboard.
+  static constexpr std::size_t maxPendingSharedPackets = 1024;
+  // Returns whether all bytes were sent.
   using Send = std::function<bool(std::string_view datagram)>;
 
+  // The result of a first transmission: whether it was sent, held, or lost for lack of memory; and why the
+  // oldest datagram was dropped to make room, if it was.
   struct First {
-    wire::Reason fate;                      // sent, held, or no memory to wait
-    std::optional<wire::Reason> pushedOut;  // of the oldest, which made room
+    wire::Reason fate;
+    std::optional<wire::Reason> pushedOut;
   };
+  // How many datagrams were sent for the first time, sent again and given up.
   struct Tick {
-    std::size_t sent = 0;  // for the first time
+    std::size_t sent = 0;
     std::size_t sentAgain = 0;
     std::size_t givenUp = 0;
   };
 
-  // `shared`: by one-shot messages, each of which has a back end of its own that begins at event number 1.
+  // `shared`: by one-shot messages, each of which has its own back end, which starts at event number 1.
   MessageQueue(bool reliableUDP, bool shared, Send send);
 
-  // `charge` goes with the datagram as long as it waits; none: it may not wait.
+  // `charge` pays for the datagram while it waits. Without a charge it cannot wait.
   First tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                      std::optional<platform::Charge> charge);
   Tick tick();
-  // Removes the oldest one of this number, where it is shared the one that SentCopies names; false: no such
-  // one waits.
+  // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. False
+  // if there is none.
   bool acknowledge(std::uint16_t eventNumber);
   void clear() { _pending.clear(); }
 
   bool reliableUDP() const { return _reliableUDP; }
   bool empty() const { return _pending.empty(); }
   std::size_t size() const { return _pending.size(); }
-  // Of those that wait, the ones that never went out.
+  // How many of the waiting datagrams were never sent.
   std::size_t notSent() const;
 
  private:
   bool send(const UDPPacketToSend& record);
-  // True: the record leaves.
+  // These return true if the record is to be removed.
   bool check(UDPPacketToSend& record, Tick& result);
   bool checkAcknowledgement(UDPPacketToSend& record, Tick& result);
 
   const bool _reliableUDP;
   const std::size_t _most;
   const Send _send;
-  std::list<UDPPacketToSend> _pending;  // oldest first
+  // Oldest first.
+  std::list<UDPPacketToSend> _pending;
   std::uint64_t _lastSerial = 0;
-  std::optional<SentCopies> _copies;  // where it is shared
+  // Only if the queue is shared.
+  std::optional<SentCopies> _copies;
 };
 
 }  // namespace veltrad::backends

@@ -1,4 +1,4 @@
-// First transmissions on the session's thread; ticks and acknowledgements on the work pool.
+// Sends datagrams, reads acknowledgements and stops when nothing waits.
 #include "backends/dashboard/network_proc_queue.h"
 
 #include <endian.h>
@@ -7,16 +7,15 @@
 
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/reporting_packet.h"
-#include "platform/counters.h"
 #include "platform/log.h"
 
 namespace veltrad::backends {
 
 namespace {
-constexpr int kMostReadAtOnce = 64;  // then the pool's other handlers have their turn
+// Then the pool's other handlers run.
+constexpr int kMostReadAtOnce = 64;
 constexpr std::size_t kEventIDAt = offsetof(tagReportingPacketHeader, eventID);
-// What a datagram that waits keeps beside its bytes: the record, its place in the list, the copies that are
-// remembered. What a socket keeps: its objects, the timer and the read source with it.
+// Memory of a waiting datagram besides its bytes, and of a socket with its timer and read source.
 constexpr std::size_t kDatagramBytes = 512;
 constexpr std::size_t kSocketBytes = 8192;
 
@@ -65,8 +64,8 @@ void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eve
   if (!_armed) armTimer(now());
 }
 
-// Events that wait in a batch make room for a datagram that is to be acknowledged, but not for one that most
-// likely need not wait at all.
+// Batched events are dropped for a datagram that will wait for its acknowledgement, but not for one that
+// probably will not wait at all.
 std::optional<platform::Charge> NetworkProcQueue::chargeFor(std::size_t datagram) const {
   if (!_account) return platform::Charge();
   const std::size_t bytes = datagram + kDatagramBytes;
@@ -91,7 +90,7 @@ void NetworkProcQueue::cleanup() {
       return cleanupSources();
     }
   }
-  _queues->lingers(shared_from_this(), _account ? std::int64_t{_account->uid()} : DashboardQueues::kNobody);
+  _queues->lingers(shared_from_this(), DashboardQueues::userOf(_account.get()));
 }
 
 bool NetworkProcQueue::chargeSocket() {
@@ -107,7 +106,7 @@ void NetworkProcQueue::end() {
   cleanupSources();
 }
 
-// `reason`: of those that went out.
+// `reason` applies to the datagrams that were sent.
 void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();
   _counters.count(wire::Reason::ended_before_sent, notSent);
@@ -149,7 +148,7 @@ void NetworkProcQueue::myPeriodicTask(DeliverySchedule::Time time) {
 }
 
 void NetworkProcQueue::awaitReading() {
-  // Not a reason to live on: the back end and the armed timer are.
+  // The handler does not keep the queue alive; the back end and the armed timer do.
   _readSource->wait([weak = weak_from_this()] {
     if (const auto self = weak.lock()) self->readable();
   });

@@ -1,5 +1,5 @@
-// What a dashboard back end does on the network: its socket, its waiting datagrams, its timer. Any thread;
-// ticks and acknowledgements come on the work pool.
+// The network side of a dashboard back end: its socket, waiting datagrams and timer. Any thread; ticks and
+// acknowledgements are handled on the work pool.
 #pragma once
 
 #include <chrono>
@@ -16,46 +16,43 @@
 #include "backends/dashboard/udp_socket.h"
 #include "backends/lock_ranks.h"
 #include "base/mutex.h"
+#include "platform/counters.h"
 #include "platform/memory_budget.h"
-
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
 
 namespace veltrad::backends {
 
 class DashboardQueues;
 class WorkPool;
 
-// A serial queue: one thing at a time, in the order in which it came, on the thread that brings it; a first
-// transmission never blocks and costs no change of thread. The armed timer keeps it alive after its back ends
-// (one, or those of one-shot messages) until nothing waits, the last resort, or end(); the socket is closed
-// then, or with the object, once. What waits is charged to the user, and the socket when it outlives its back
-// ends. `counters` must outlive it.
+// Serialises its operations with a lock; each runs on the caller's thread, and a first transmission never
+// blocks. After its back ends (one, or those of one-shot messages) have gone, the armed timer keeps it alive
+// until nothing waits, the last resort is due, or end() is called; the socket is closed then. Waiting
+// datagrams are charged to the user, and so is the socket once it outlives the back ends. `counters` must
+// outlive the queue.
 class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQueue> {
  public:
   struct Kind {
     bool reliableUDP = false;
-    bool shared = false;  // by one-shot messages
+    bool shared = false;
     std::chrono::milliseconds period{};
   };
-  // For one back end. `socket` is connected. `account`: null, nobody pays.
+  // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
                    std::shared_ptr<platform::MemoryAccount> account, std::shared_ptr<DashboardQueues> queues,
                    platform::Counters& counters);
   // Counts the datagrams that still wait as lost.
   ~NetworkProcQueue();
 
-  // Acknowledgements are read from now on; false: they cannot be.
+  // From now on acknowledgements are read. False if they cannot be.
   bool startReading(WorkPool& pool);
-  // No lock is held: older things of the user may have to make room.
+  // Called without a lock, because older data of the user may be dropped to make room.
   void tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
-  // One back end more, which calls cleanup(); false: it has stopped already.
+  // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
-  // One back end lets go. With the last it stops: at once when nothing waits, else when nothing waits any
-  // more, 9.5 s after the next tick at the latest.
+  // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
+  // tick at the latest.
   void cleanup();
-  // Others need the room: what waits is given up, unless a back end has come since.
+  // Gives up what waits, to make room for other queues, unless a back end has joined.
   void end();
   bool reliableUDP() const { return _kind.reliableUDP; }
 
@@ -68,11 +65,10 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
-  // False: there is no room for a socket that outlives its back ends.
+  // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);
   void giveUp(wire::Reason reason) REQUIRES(_mutex);
 
-  // Constant after construction.
   platform::Counters& _counters;
   const Kind _kind;
   const std::shared_ptr<platform::MemoryAccount> _account;
@@ -82,7 +78,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   UDPSocket _socket GUARDED_BY(_mutex);
   MessageQueue _messageQueue GUARDED_BY(_mutex);
   DeliverySchedule _schedule GUARDED_BY(_mutex);
-  std::unique_ptr<PoolTimer> _timer GUARDED_BY(_mutex);  // null: stopped
+  // Null once the queue has stopped.
+  std::unique_ptr<PoolTimer> _timer GUARDED_BY(_mutex);
   bool _armed GUARDED_BY(_mutex) = false;
   std::size_t _backEnds GUARDED_BY(_mutex) = 1;
   std::optional<platform::Charge> _socketCharge GUARDED_BY(_mutex);

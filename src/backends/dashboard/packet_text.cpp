@@ -1,4 +1,4 @@
-// The items of a payload, ordered, escaped and cut.
+// Sorts, escapes and cuts the items of a payload.
 #include "backends/dashboard/packet_text.h"
 
 #include <algorithm>
@@ -31,7 +31,7 @@ bool isSpecial(char c) {
   return c == '\n' || c == '\\' || c == '=';
 }
 
-// The field is a NUL-terminated text, so a NUL ends what is put into it.
+// The field is NUL-terminated, so each text ends at its first NUL.
 std::string_view untilNUL(std::string_view text) {
   return text.substr(0, text.find('\0'));
 }

@@ -1,4 +1,4 @@
-// The text field of a dashboard packet: "key=value" items, shortest values first. Pure; any thread.
+// The text field of a dashboard packet: "key=value" items, shortest values first.
 #pragma once
 
 #include <cstddef>
@@ -8,18 +8,18 @@
 
 namespace veltrad::backends {
 
-// Writes into the 1,024 bytes of a packet's text field: at most 1,023 bytes, what is beyond is cut off. The
-// field must outlive it.
+// Writes at most 1,023 bytes and a NUL into a packet's text field, which must outlive it. Further bytes are
+// cut off.
 class PacketText {
  public:
-  static constexpr std::size_t kSize = 1024;  // with the terminating NUL
+  static constexpr std::size_t kSize = 1024;
 
   explicit PacketText(char (&field)[kSize]) : _field(field) { _field[0] = '\0'; }
 
-  // Each item is a blank, the key as it is, "=" and the sanitized description of the value. Items stand in
-  // the order of their descriptions' length in characters, among equal ones in the order of their keys.
+  // Each item is a blank, the key, "=" and the sanitized description of the value. Items are sorted by the
+  // length of the description in characters, then by key.
   void append(const Dictionary& payload);
-  // The text without line breaks, with "\" and "=" escaped by a backslash; "empty" when that leaves nothing.
+  // Removes line breaks and escapes "\" and "=" with a backslash. An empty result becomes "empty".
   void sanitize(std::string_view text);
 
   std::size_t length() const { return _length; }

@@ -29,8 +29,4 @@ void PoolTimer::arm(std::chrono::steady_clock::time_point when, std::function<vo
   });
 }
 
-void PoolTimer::cancel() {
-  _impl->timer.cancel();
-}
-
 }  // namespace veltrad::backends

@@ -1,4 +1,4 @@
-// One timer of the shared pool. Its owner's lock guards it; handlers run on the pool's threads.
+// A timer of the shared pool. Its owner's lock guards it; handlers run on the pool's threads.
 #pragma once
 
 #include <chrono>
@@ -9,19 +9,16 @@ namespace veltrad::backends {
 
 class WorkPool;
 
-// The handler keeps what it needs alive; it is let go when the timer is cancelled or armed anew. One that was
-// due already may still run then: it looks at the clock itself.
+// The handler keeps what it needs alive. It is released when the timer is armed again or destroyed; if it was
+// due already, it may still run, so it checks the time itself.
 class PoolTimer {
  public:
-  // Null where the pool cannot be started.
+  // Null if the pool cannot be started.
   static std::unique_ptr<PoolTimer> make(WorkPool& pool);
   ~PoolTimer();
-  PoolTimer(const PoolTimer&) = delete;
-  PoolTimer& operator=(const PoolTimer&) = delete;
 
-  // Never calls `handler` itself.
+  // Does not call `handler` directly.
   void arm(std::chrono::steady_clock::time_point when, std::function<void()> handler);
-  void cancel();
 
  private:
   struct Impl;

@@ -1,4 +1,4 @@
-// Readiness to read, by Asio's reactor.
+// Waits with Asio's reactor.
 #include "backends/dashboard/read_source.h"
 
 #include <asio/io_context.hpp>

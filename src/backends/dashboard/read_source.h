@@ -1,5 +1,4 @@
-// Tells when a descriptor can be read, on the shared pool. Its owner's lock guards it; handlers run on the
-// pool's threads.
+// Waits on the shared pool until a descriptor can be read. Its owner's lock guards it.
 #pragma once
 
 #include <functional>
@@ -9,16 +8,15 @@ namespace veltrad::backends {
 
 class WorkPool;
 
-// Does not own the descriptor, which must stay open until the source is gone.
+// Does not own the descriptor, which must stay open until the source is destroyed.
 class ReadSource {
  public:
-  // Null, where the descriptor cannot be watched.
+  // Null if the descriptor cannot be watched.
   static std::unique_ptr<ReadSource> make(WorkPool& pool, int descriptor);
-  ~ReadSource();  // a handler that was due already may still run
-  ReadSource(const ReadSource&) = delete;
-  ReadSource& operator=(const ReadSource&) = delete;
+  // A handler that was due already may still run.
+  ~ReadSource();
 
-  // Calls `handler` once, never from here, when there is something to read or an error waits.
+  // Calls `handler` once, on a thread of the pool, when there is something to read or an error.
   void wait(std::function<void()> handler);
 
  private:

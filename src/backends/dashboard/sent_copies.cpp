@@ -1,4 +1,4 @@
-// Copies in the order in which they went out.
+// Keeps the copies in the order in which they were sent.
 #include "backends/dashboard/sent_copies.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-// Which datagram an acknowledgement answers where several wait under one event number. One thread at a time.
+// Finds the datagram that an acknowledgement answers where several datagrams have the same event number.
 #pragma once
 
 #include <cstddef>
@@ -8,21 +8,19 @@
 
 namespace veltrad::backends {
 
-// An acknowledgement names an event number alone. It answers the oldest copy of that number that was sent and
-// not answered yet, so that each copy confirms once at most: the second answer to a datagram that was sent
-// twice finds its own copy and confirms no other datagram. A copy that nobody has answered for 9 ticks, the
-// longest that a datagram waits for its next transmission, is taken as lost: from then on it takes no answer
-// from another. Where copies were lost, a later answer may go to an earlier datagram, and the later one is
-// sent once more than it needed.
+// An acknowledgement contains only an event number. It answers the oldest unanswered copy with that number,
+// so the second answer to a datagram that was sent twice does not confirm another datagram. A copy that is
+// not answered within 9 ticks, the longest time between two transmissions, is considered lost. If copies were
+// lost, an answer may be matched to an earlier datagram; the later one is then sent once more than necessary.
 class SentCopies {
  public:
   static constexpr std::uint64_t kTicks = 9;
 
-  // `most`: of copies that are remembered; beyond it the oldest is forgotten.
+  // `most`: how many copies are remembered; further ones replace the oldest.
   explicit SentCopies(std::size_t most) : _most(most) {}
 
   void sent(std::uint64_t datagram, std::uint16_t eventNumber);
-  // The datagram of the copy that is answered herewith; nothing: none is on its way.
+  // Returns the datagram whose copy is answered, if any is unanswered.
   std::optional<std::uint64_t> answered(std::uint16_t eventNumber);
   void tick();
 
@@ -33,7 +31,8 @@ class SentCopies {
     std::uint16_t eventNumber;
   };
   const std::size_t _most;
-  std::deque<Copy> _copies;  // oldest first
+  // Oldest first.
+  std::deque<Copy> _copies;
   std::uint64_t _tick = 0;
 };
 

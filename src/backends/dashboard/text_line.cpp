@@ -1,4 +1,4 @@
-// The packet's fields, restored and printed.
+// Prints the fields of a packet.
 #include "backends/dashboard/text_line.h"
 
 #include <endian.h>

@@ -1,4 +1,4 @@
-// The dashboard text line: one packet for a person to read. Pure; any thread.
+// The dashboard text line: one packet in readable form.
 #pragma once
 
 #include <string>
@@ -7,8 +7,8 @@
 
 namespace veltrad::backends {
 
-// From the packet alone: time, device, sender code, client version, session, event, method, response code,
-// text. A character that the packet's end cut is left out.
+// Time, device, sender code, client version, session, event, method, response code and text. An incomplete
+// character at the end of the text is left out.
 std::string writeLocalLog(const tagReportingPacket& packet);
 
 }  // namespace veltrad::backends

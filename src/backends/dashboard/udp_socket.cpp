@@ -1,4 +1,4 @@
-// UDP by the system's own calls.
+// UDP with the system's socket calls.
 #include "backends/dashboard/udp_socket.h"
 
 #include <arpa/inet.h>
@@ -9,7 +9,8 @@
 namespace veltrad::backends {
 
 namespace {
-constexpr int kMostReceivedBefore = 1024;  // more than a receive buffer holds
+// More than a receive buffer holds.
+constexpr int kMostReceivedBefore = 1024;
 
 const sockaddr* generic(const sockaddr_in& address) {
   return reinterpret_cast<const sockaddr*>(&address);

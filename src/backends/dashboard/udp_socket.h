@@ -1,4 +1,4 @@
-// A connected IPv4 UDP socket that never blocks. A plain value with one owner; any one thread at a time.
+// A connected IPv4 UDP socket that never blocks.
 #pragma once
 
 #include <netinet/in.h>
@@ -14,22 +14,22 @@
 
 namespace veltrad::backends {
 
-// Dotted-decimal, four numbers, nothing else: no name is resolved.
+// Takes the dotted-decimal form only; names are not resolved.
 std::optional<sockaddr_in> parseIPv4Address(const std::string& text, std::uint16_t port);
 
-// Failures are errno's numbers.
+// Failures are values of errno.
 class UDPSocket {
  public:
   static Result<UDPSocket, int> open();
 
-  // To the wildcard address and a port of the system's choice.
+  // Binds to the wildcard address and a port that the system chooses.
   std::optional<int> bindToAnyPort();
-  // From then on only datagrams from this address arrive: what came before from others is discarded.
+  // Then only datagrams from this address arrive; those that arrived earlier are discarded.
   std::optional<int> connect(const sockaddr_in& address);
-  // True when the whole datagram went out. False: the buffer is full, no route, the peer refused an earlier
-  // one, closed.
+  // Returns whether the whole datagram was sent.
   bool send(std::string_view datagram);
-  // The bytes of one datagram, what does not fit cut off; none when there is none, or an error was reported.
+  // Returns the length of one datagram, cut at `size`. Nothing if there is no datagram or an error was
+  // reported.
   std::optional<std::size_t> receive(char* buffer, std::size_t size);
 
   int descriptor() const { return _socket.get(); }

@@ -1,4 +1,4 @@
-// A value's text and its length.
+// Makes a value's text and counts its characters.
 #include "backends/dashboard/value_description.h"
 
 #include <algorithm>

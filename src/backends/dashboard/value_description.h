@@ -1,5 +1,4 @@
-// How a value looks in a dashboard text: texts as they are, numbers in decimal, anything else "null". Pure;
-// any thread.
+// The form of a value in a dashboard text: texts unchanged, numbers in decimal, anything else "null".
 #pragma once
 
 #include <cstddef>
@@ -10,11 +9,12 @@
 
 namespace veltrad::backends {
 
-// Of a text it keeps a pointer only: the value must outlive it.
+// Refers to the text of the value, which must outlive it.
 class ValueDescription {
  public:
   std::string_view text() const { return _text ? std::string_view(*_text) : std::string_view(_made); }
-  std::size_t characters() const { return _characters; }  // of Unicode
+  // The number of Unicode characters.
+  std::size_t characters() const { return _characters; }
 
  private:
   friend ValueDescription descriptionForObject(const Value& value);
@@ -24,7 +24,7 @@ class ValueDescription {
   std::size_t _characters = 0;
 };
 
-// Integers in decimal, reals in the shortest form that reads back the same, booleans 1 and 0.
+// Reals have the shortest form that reads back the same, booleans are 1 and 0.
 ValueDescription descriptionForObject(const Value& value);
 
 }  // namespace veltrad::backends

@@ -1,4 +1,4 @@
-// The shared pool on Asio. Its threads run handlers only.
+// The shared pool, on Asio.
 #include "backends/dashboard/work_pool.h"
 
 #include <asio/executor_work_guard.hpp>
@@ -28,7 +28,7 @@ struct WorkPool::Impl {
       }
     } catch (const std::system_error& error) {
       logError("The work pool cannot be started: %s", error.what());
-      if (!threads.empty()) return;  // one thread does the work of two
+      if (!threads.empty()) return;  // one thread is enough
       guard.reset();
       context.reset();
     }
@@ -76,7 +76,8 @@ void WorkPool::drain(std::chrono::steady_clock::time_point deadline) {
 }
 
 void WorkPool::discard() {
-  std::unique_ptr<asio::io_context> context;  // handlers own objects that take locks: destroyed outside ours
+  // Destroyed without the lock, because handlers own objects that take locks.
+  std::unique_ptr<asio::io_context> context;
   {
     const Lock held(_impl->mutex);
     context.swap(_impl->context);

@@ -1,4 +1,4 @@
-// The process's shared pool: two threads for timers and sockets that nobody waits at. Any thread.
+// The process's shared pool of two threads for timers and sockets. Any thread.
 #pragma once
 
 #include <chrono>
@@ -10,21 +10,19 @@ class io_context;
 
 namespace veltrad::backends {
 
-// The threads start with the first timer. It outlives every PoolTimer and ReadSource, but for those that only
-// their own handlers keep: discard() destroys them with it.
+// The threads start with the first timer. Outlives every PoolTimer and ReadSource, except those that only
+// their handlers hold: discard() destroys these.
 class WorkPool {
  public:
   WorkPool();
   ~WorkPool();
-  WorkPool(const WorkPool&) = delete;
-  WorkPool& operator=(const WorkPool&) = delete;
 
-  // For PoolTimer and ReadSource alone. Null: descriptors or threads are short; one error line has said so.
+  // Only for PoolTimer and ReadSource. Null, after one error line, if descriptors or threads are short.
   asio::io_context* context();
 
-  // Waits until no timer is armed and no source is watched, at most until `deadline`; then the threads end.
+  // Waits until no timer is armed and no source is watched, or until `deadline`; then ends the threads.
   void drain(std::chrono::steady_clock::time_point deadline);
-  // After drain(), when no other thread uses the pool any more: destroys the handlers that still wait.
+  // Destroys the handlers that still wait. Called after drain(), when no other thread uses the pool.
   void discard();
 
  private:

@@ -1,4 +1,4 @@
-// The decision on a client entry, step by step.
+// Decides in the order in which a client entry's conditions apply.
 #include "backends/https/client_decision.h"
 
 #include <algorithm>
@@ -9,7 +9,7 @@
 namespace veltrad::backends {
 
 namespace {
-// The first element whose "country" array holds the country, letter case respected; or null.
+// The first element whose "country" array contains the country (case-sensitive); null if none does.
 const config::CountryThreshold* countryEntry(const config::ClientEntry& entry,
                                              const std::optional<std::string>& country) {
   if (!entry.perCountrySamplingThresholds || !country) return nullptr;
@@ -45,7 +45,6 @@ void decideOnSampling(const config::ClientEntry& entry, const ClientFacts& facts
     verdict.reason = wire::Reason::no_threshold;
     return;
   }
-  // A factor equal to the threshold is sampled in.
   if (facts.samplingFactor <= *verdict.threshold) {
     verdict.state = kBackendReporting;
     return;

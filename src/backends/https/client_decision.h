@@ -1,5 +1,4 @@
-// Whether and how a back end reports for one client entry of its storebag section. Plain functions from
-// values to a verdict; any thread.
+// Decides whether and how a back end reports for one client entry of its storebag section.
 #pragma once
 
 #include <cstdint>
@@ -11,30 +10,36 @@
 
 namespace veltrad::backends {
 
-// What is known of the client, the device and the user at the time of the decision.
+// The client, the device and the user at the time of the decision.
 struct ClientFacts {
-  bool consent = false;                // the user's, to diagnostic submission
-  std::optional<std::string> country;  // the current locale's
+  // The user's consent to diagnostic submission.
+  bool consent = false;
+  // The country of the current locale.
+  std::optional<std::string> country;
   std::string productFamily;
   std::optional<std::string> hardwareType;
-  double samplingFactor = 0;  // this back end's draw, in [0, 1)
+  double samplingFactor = 0;
 };
 
-// A reason to be disabled ends the decision at once: what later steps would have found is absent.
+// The decision ends at the first reason to be disabled; the results of later steps are then absent.
 struct ClientVerdict {
-  std::int32_t state = 1;              // BackendState: 1 disabled, 2 reporting, 3 held by sampling
-  std::optional<wire::Reason> reason;  // unless it reports
+  // A BackendState: disabled, reporting or held by sampling.
+  std::int32_t state = 1;
+  // Unless it reports.
+  std::optional<wire::Reason> reason;
   std::int32_t hierarchy = 0;
-  std::int32_t overrideDNU = 0;  // the entry's own number; 1 overrides consent
-  std::int32_t dnuType = 0;      // 0 consent respected; overridden: 1 without consent, 2 with it
+  // The number in the entry; 1 overrides consent.
+  std::int32_t overrideDNU = 0;
+  // 0: consent is respected. 1: it is overridden and absent. 2: it is overridden and given.
+  std::int32_t dnuType = 0;
   const config::Filters* filters = nullptr;
 
   bool samplingReached = false;
   std::optional<double> threshold;
-  // A per-country entry replaced the threshold; this is what it was.
+  // A per-country entry replaced the threshold; this was its value before.
   bool countryThreshold = false;
   std::optional<double> thresholdBefore;
-  // Set when the factor lies above the threshold: then the entry's "override_sampling".
+  // The factor is above the threshold, so the entry's "override_sampling" applies.
   bool overrideReached = false;
   std::optional<double> overrideSampling;
 };

@@ -1,30 +1,17 @@
-// Event building.
+// Builds events.
 #include "backends/https/event.h"
 
 #include <fmt/format.h>
 
-#include <cmath>
-
+#include "backends/https/json_message.h"
 #include "config/client_types.h"
 
 namespace veltrad::backends {
 
 namespace {
-// Bit n stands for client type n: 7, 11 and 13.
-constexpr std::uint32_t kNumericSessionIDTypes = 0x2880;
-
-// On internal builds only.
-bool reportsNumericSessionID(bool isInternal, std::int32_t compType) {
-  return isInternal && compType >= 0 && compType <= 13 && (kNumericSessionIDTypes >> compType & 1u) != 0;
-}
-
 std::int32_t coarsenedStart(double startTimeStamp) {
   const auto start = static_cast<std::int32_t>(static_cast<std::int64_t>(startTimeStamp));
   return start / 60 * 60;
-}
-
-double finiteOrMinusOne(double seconds) {
-  return std::isfinite(seconds) ? seconds : -1.0;
 }
 }  // namespace
 
@@ -40,7 +27,7 @@ Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::stri
   const double clientTS =
       finiteOrMinusOne(startTS + (platform::timevalToSeconds(message.timestamp) - facts.startTimeStamp));
 
-  // In the order of the keys' bytes, so that neither the list nor the merge needs sorting.
+  // The keys are sorted by their bytes, so that neither the list nor the merge has to sort them.
   std::vector<Dictionary::Entry> fields;
   fields.reserve(17);
   const auto add = [&fields](const char* key, Value value) { fields.emplace_back(key, std::move(value)); };
@@ -55,7 +42,7 @@ Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::stri
   if (device.hardwareType) add("_productModel", *device.hardwareType);
   add("_reportVers", fmt::format("{}.{}", facts.selfVersion.major, facts.selfVersion.minor));
   add("_sender", senderCode(facts.compType));
-  if (reportsNumericSessionID(device.isInternal, facts.compType)) {
+  if (device.isInternal && isAdaptorClientType(facts.compType)) {
     add("_sessionID", facts.sessionID);
   } else if (facts.combinedSessionIDString) {
     add("_sessionID", *facts.combinedSessionIDString);

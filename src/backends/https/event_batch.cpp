@@ -1,4 +1,4 @@
-// The batch's counts and bounds.
+// Keeps a batch within its bounds.
 #include "backends/https/event_batch.h"
 
 #include "formats/json.h"
@@ -6,7 +6,7 @@
 namespace veltrad::backends {
 
 EventSize sizeOfEvent(const Dictionary& event) {
-  // While a flush runs there are the compact text, the readable one and the compressed body.
+  // During a flush there are the compact text, the readable text and the compressed body.
   constexpr std::size_t kTexts = 3;
   const std::size_t json = formats::jsonBytesAtMost(event);
   return {json, sizeof(Dictionary) + keptBytes(event) + kTexts * json};

@@ -1,4 +1,4 @@
-// The events that wait for a flush, how many of each method, and how many bytes. Guarded by its owner.
+// The events that wait for a flush, with their number per method and their size. The owner guards it.
 #pragma once
 
 #include <cstddef>
@@ -13,41 +13,39 @@
 
 namespace veltrad::backends {
 
-// What an event costs, in bytes.
+// Upper bounds in bytes: of an event's JSON text, and of the memory for the event and what a flush makes of
+// it.
 struct EventSize {
-  std::size_t json = 0;  // of its JSON text, at most
-  std::size_t charged =
-      0;  // of memory: the event, and the texts and the compressed body that a flush makes of it
+  std::size_t json = 0;
+  std::size_t charged = 0;
 };
 EventSize sizeOfEvent(const Dictionary& event);
 
 class EventBatch {
  public:
-  // Whatever the thresholds say, a batch holds no more: a storebag without limits must not grow the daemon
-  // without end.
+  // The bounds of a batch, whatever the thresholds in the storebag are. Bytes are those of the JSON texts.
   static constexpr std::size_t kMostEvents = 4096;
-  static constexpr std::size_t kMostBytes = 4u << 20;  // of JSON; what they keep is charged
+  static constexpr std::size_t kMostBytes = 4u << 20;
 
   std::size_t size() const { return _events.size(); }
   std::size_t chargedBytes() const { return _bytes.charged; }
-  // The turn that the oldest event was added with; nothing: there is none.
+  // The turn with which the oldest event was added.
   std::optional<std::uint64_t> oldestTurn() const;
 
-  // True when an event of this method may only be added after a flush: more than `threshold` were added since
-  // the counts were last cleared. Signed comparison.
+  // Whether a flush must come before the next event of this method, because more than `threshold` (signed)
+  // were added since the counts were last cleared.
   bool thresholdReached(std::int32_t method, std::int32_t threshold) const;
-  // True when the bound on events or bytes is reached.
+  // Whether the event would exceed a bound.
   bool full(const EventSize& event) const;
   void add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn);
-  // The oldest one; none where the batch is empty.
   void dropOldest();
-  // After a flush that a threshold caused, an event of the method counts from 0 whatever the flush did.
+  // Called after a flush that a threshold caused, whatever its result.
   void restartCount(std::int32_t method) { _counts[method] = 0; }
 
   void setSessionID(const std::string& sessionID);
-  // Leaves it empty; the counts go too.
+  // Returns the events and clears the counts.
   std::vector<Dictionary> take();
-  // Leaves it empty; the counts stay.
+  // Drops the events but keeps the counts.
   void discard();
 
  private:

@@ -1,6 +1,7 @@
-// Events posted, and what becomes of them.
+// Posts events and handles the answers.
 #include "backends/https/event_posts.h"
 
+#include <fmt/format.h>
 #include <fmt/printf.h>
 
 #include <cstdint>
@@ -15,7 +16,7 @@ namespace {
 wire::Reason reasonOf(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
-    case http::HTTPError::Kind::tooLarge:  // never for a post: its answer is not kept
+    case http::HTTPError::Kind::tooLarge:
       return wire::Reason::post_failed;
     case http::HTTPError::Kind::tooMany:
       return wire::Reason::too_many_posts;
@@ -60,8 +61,10 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
     return refusePost(*backEnd, post.eventCount, post.completion);
   }
+  backEnd->postBegins();
   const auto answered = [this, backEnd, postedTo = *url, eventCount = post.eventCount,
                          completion = std::move(post.completion)](const http::HTTPResult& result) {
+    backEnd->postEnded(result ? fmt::format("HTTP {}", result.value().status) : result.error().description);
     auto error = handleAnswer(*backEnd, result, postedTo, eventCount);
     if (completion) completion(std::nullopt, std::move(error));
   };
@@ -95,7 +98,7 @@ std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& back
   const std::string text =
       fmt::sprintf("backend %s disabled by server %d return code", backEnd.name(), status);
   logInfo("postJSONMessage: %s", text.c_str());
-  backEnd.setState(kBackendDisabled);
+  backEnd.setState({kBackendDisabled, wire::Reason::server_error});
   return wire::makeReportingError(text, status);
 }
 

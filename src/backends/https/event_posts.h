@@ -1,5 +1,4 @@
-// The posts of events: from the events to their message, from its answer to their fate. Any thread; answers
-// come on the HTTP thread.
+// Makes messages of events, posts them and handles the answers. Any thread; answers come on the HTTP thread.
 #pragma once
 
 #include <cstddef>
@@ -16,47 +15,44 @@
 
 namespace veltrad::backends {
 
-// One for all HTTPS back ends, which it outlives, their posts included.
+// One object serves all HTTPS post back ends. It outlives them and their posts.
 class EventPosts {
  public:
   EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters)
       : _http(http), _clock(clock), _counters(counters) {}
 
-  // What is posted, and who is told of its end.
   struct Post {
     std::string json;
     std::optional<EventMap> eventMap;
     std::size_t eventCount = 0;
-    // Pays for the post and, with `completionBytes`, for what its completion keeps.
+    // Pays for the post and for `completionBytes`, which the completion (it may be empty) keeps.
     platform::Charge charge;
     std::size_t completionBytes = 0;
-    VeltraBackend::FlushCompletion completion;  // may be empty
+    VeltraBackend::FlushCompletion completion;
   };
 
-  // Takes out what JSON cannot carry, and counts it.
+  // Removes and counts fields that JSON cannot represent.
   void restrict(Dictionary& event) const;
   JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
                                              bool wantPretty) const;
-  // An answer 5xx disables the back end, which the post keeps alive.
+  // The post keeps the back end alive. A status of 5xx disables the back end.
   void postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
                        const std::optional<std::string>& url, Post post);
-  // Nothing is kept for what is not posted: such events are lost, counted, and `completion` is told.
+  // Counts the events as lost and calls `completion`, if there is one.
   void refusePost(VeltraBackend& backEnd, std::size_t eventCount,
                   const VeltraBackend::FlushCompletion& completion);
-  // The lines that were held back: before the daemon ends.
+  // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
 
  private:
-  // Nothing: the post ended without an error.
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
                                                    const std::string& url, std::size_t eventCount);
 
-  // Constant after construction.
   http::HTTPClient& _http;
   const platform::Clock& _clock;
   platform::Counters& _counters;
 
-  // One for all, so that many sessions make no more lines than one.
+  // Shared, so that many sessions log no more lines than one.
   platform::LimitedLine _errorLine{"posts"};
 };
 

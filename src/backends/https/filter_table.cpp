@@ -1,4 +1,4 @@
-// The filter table applied.
+// Applies filters to events.
 #include "backends/https/filter_table.h"
 
 #include <optional>
@@ -12,8 +12,8 @@ namespace veltrad::backends {
 namespace {
 using config::FilterAction;
 
-// A text's digest; that of the JSON text for a number or boolean; nothing for what has no text, which must
-// then be removed: a field that was to be hashed never leaves in clear.
+// The digest of a text, or of the JSON text of a number or boolean. Nothing for other values, which are then
+// removed, because a field that is to be hashed must never leave in clear.
 std::optional<std::string> digestOf(const Value& value) {
   if (const std::string* text = value.asString()) return VeltraBackend::convertIntoSHA256(*text);
   if (value.isNumber() || value.isBoolean())

@@ -1,4 +1,4 @@
-// Which fields of an event may leave the device, and in which form. Its owner's thread.
+// Decides which fields of an event may leave the device, and in which form.
 #pragma once
 
 #include <cstddef>
@@ -8,10 +8,10 @@
 
 namespace veltrad::backends {
 
-// The first record that fits a field decides; records after it are not looked at.
+// The first record that matches a field decides.
 class FilterTable {
  public:
-  // Replaces the table; an empty array leaves the earlier one in force. `filters` outlive this.
+  // Replaces the filters, unless the array is empty. `filters` must outlive this object.
   void createFiltersFromArray(const config::Filters& filters) {
     if (filters.elements > 0) _filters = &filters;
   }
@@ -19,8 +19,7 @@ class FilterTable {
     std::size_t removed = 0;
     std::size_t hashed = 0;
   };
-  // Applies the table in place, by the event's own "_method" and "_status" (0 when missing). Linear in the
-  // fields and in the records of their keys.
+  // Filters the event in place by its own "_method" and "_status" (0 if missing).
   Outcome filterEvent(Dictionary& event) const;
 
  private:

@@ -1,7 +1,5 @@
-// The batch under its lock.
+// Guards the batch and keeps its charge up to date.
 #include "backends/https/held_events.h"
-
-#include "platform/counters.h"
 
 namespace veltrad::backends {
 
@@ -10,9 +8,9 @@ HeldEvents::~HeldEvents() {
   _counters.count(wire::Reason::ended_before_flush, _batch.size());
 }
 
-bool HeldEvents::empty() const {
+std::size_t HeldEvents::size() const {
   const Lock held(_mutex);
-  return _batch.size() == 0;
+  return _batch.size();
 }
 
 HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,
@@ -82,9 +80,9 @@ void HeldEvents::dropOldest() {
   _counters.count(wire::Reason::event_over_share);
 }
 
-// The charge follows the batch; how many events had to go because it could not grow.
+// Adjusts the charge to the batch. Returns how many events were dropped because the charge could not grow.
 std::size_t HeldEvents::settle() {
-  if (_charge.bytes() == 0) return 0;  // nobody pays
+  if (_charge.bytes() == 0) return 0;  // no account
   std::size_t dropped = 0;
   for (; !_charge.resize(_batch.chargedBytes()); ++dropped) _batch.dropOldest();
   return dropped;

@@ -1,10 +1,9 @@
-// A back end's batch with what it is charged. Any thread: the session's adds and takes, others give the
-// events a new session ID or drop the oldest for newer ones of the same user.
+// A back end's batch with its memory charge. Any thread: the session's thread adds and takes events; other
+// threads set a new session ID or drop the oldest events for newer ones of the same user.
 #pragma once
 
 #include <atomic>
 #include <cstdint>
-#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
@@ -12,42 +11,38 @@
 #include "backends/https/event_batch.h"
 #include "backends/lock_ranks.h"
 #include "base/mutex.h"
+#include "platform/counters.h"
 #include "platform/memory_budget.h"
-
-namespace veltrad::platform {
-class Counters;
-}  // namespace veltrad::platform
 
 namespace veltrad::backends {
 
-// Shared, so that the account may still ask it when its back end has gone. The counters outlive it.
+// Shared, because the account may use it after its back end has gone. The counters outlive it.
 class HeldEvents final : public platform::Evictable {
  public:
+  // The charge pays for the events and for what a flush makes of them.
   struct Taken {
     std::vector<Dictionary> events;
-    platform::Charge charge;  // of the events and of what is made of them
+    platform::Charge charge;
   };
-  enum class Need {
-    room,   // none: it may be added
-    flush,  // its method's threshold is reached
-    bound,  // the batch is full
-  };
+  // Before the next event: there is room, its method's threshold requires a flush, or the batch is full.
+  enum class Need { room, flush, bound };
 
   explicit HeldEvents(platform::Counters& counters) : _counters(counters) {}
-  // Counts what still waited: a second start, or user info that never came, lets the events go.
+  // Counts the events that are lost, for example after a second start, or when user info never came.
   ~HeldEvents() override;
 
-  bool empty() const;
+  std::size_t size() const;
+  bool empty() const { return size() == 0; }
   Need needOf(std::int32_t method, std::int32_t threshold, const EventSize& size) const;
-  // How often the session ID has changed; add() with an older count gives the event the present one.
+  // How often the session ID has changed. If the count is older, add() sets the current ID in the event.
   std::uint64_t sessionIDChanges() const { return _sessionIDChanges.load(std::memory_order_acquire); }
-  // Makes room by dropping the oldest where the batch is full. `charge` pays for the event.
+  // Drops the oldest events if the batch is full. `charge` pays for the event.
   void add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
            std::uint64_t turn, std::uint64_t sessionIDChanges);
   void restartCount(std::int32_t method);
   void setSessionID(const std::string& sessionID);
   Taken take();
-  // How many there were.
+  // Returns the number of events dropped.
   std::size_t discard();
 
   std::optional<std::uint64_t> oldestTurn() const override;
@@ -62,7 +57,8 @@ class HeldEvents final : public platform::Evictable {
   mutable Mutex _mutex BACKEND_LOCK;
   EventBatch _batch GUARDED_BY(_mutex);
   platform::Charge _charge GUARDED_BY(_mutex);
-  std::string _sessionID GUARDED_BY(_mutex);  // since the first change
+  // Empty before the first change.
+  std::string _sessionID GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::backends

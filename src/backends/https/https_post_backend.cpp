@@ -1,4 +1,4 @@
-// The HTTPS post backend: what becomes of a message, and the flush.
+// Posts or batches messages, and flushes batches.
 #include "backends/https/https_post_backend.h"
 
 #include <utility>
@@ -56,12 +56,19 @@ void HTTPSPostBackend::updateState() {
   setState(_clientState.updateBackendState());
 }
 
+BackendActivity HTTPSPostBackend::activity() const {
+  BackendActivity activity = VeltraBackend::activity();
+  activity.held = _held->size();
+  return activity;
+}
+
 std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
   if (state() == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
     return std::nullopt;
   }
-  const std::uint64_t sessionIDChanges = _held->sessionIDChanges();  // before the facts are taken
+  // Read before the facts, so that a change between the two is noticed.
+  const std::uint64_t sessionIDChanges = _held->sessionIDChanges();
   const auto facts = this->facts();
   const bool batching = _clientState.batchEvents(*facts);
   NumberedMessage message = given;
@@ -80,7 +87,9 @@ std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedM
   Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
   if (facts->userInfo) event.merge(*facts->userInfo);
   filterEvent(event);
-  if (meansSamplingOverride(message.flag) && state() == kBackendHeld) setState(kBackendReporting);
+  if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
+    setState({kBackendReporting, wire::Reason::reports});
+  }
   const bool realtime = meansRealtime(message.flag);
   logDebug("HTTPSPostBackend(sendMessage): realtime is %d", realtime ? 1 : 0);
 
@@ -149,9 +158,9 @@ void HTTPSPostBackend::filterEvent(Dictionary& event) const {
 
 std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
                                                         std::uint64_t sessionIDChanges) {
-  // The event's own: user info and filters may have changed it.
+  // User info and filters may have changed the event's method.
   const std::int32_t method = event.int32("_method").value_or(0);
-  // What no event may carry need not be kept until a flush takes it out.
+  // Removes these fields now, so that they take no memory until the flush.
   _posts.restrict(event);
   std::optional<std::string> flushed;
   const EventSize size = sizeOfEvent(event);
@@ -170,7 +179,7 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platfo
   return flushed;
 }
 
-// Batched, or there is no room for it, even without what the user's other batches hold.
+// Drops events of the user's other batches if necessary.
 wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
                                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
   auto charge = account ? account->keep(size.charged) : platform::Charge();

@@ -1,5 +1,5 @@
-// HTTPSPostBackend: messages become JSON events, posted at once or in batches. The session's thread sends and
-// flushes; setCorrelatedSessionID may come from another session's thread; answers come on the HTTP thread.
+// HTTPSPostBackend: posts messages as JSON events, at once or in batches. The session's thread sends and
+// flushes; another session's thread may call setCorrelatedSessionID; answers come on the HTTP thread.
 #pragma once
 
 #include <memory>
@@ -16,7 +16,7 @@ namespace veltrad::backends {
 
 class EventPosts;
 
-// What an HTTPS post back end is made from. What it refers to outlives it.
+// What an HTTPS post back end uses. The references outlive it.
 struct HTTPSPostMaking {
   platform::Random& random;
   platform::Locale& locale;
@@ -27,7 +27,7 @@ struct HTTPSPostMaking {
 
 class HTTPSPostBackend final : public VeltraBackend {
  public:
-  // Null without a profile, a product family or the profile's "clients" (one error line).
+  // Null without a profile, a product family or, after an error line, the profile's "clients".
   static std::shared_ptr<HTTPSPostBackend> initWithName(
       const HTTPSPostMaking& making, const std::string& name,
       std::shared_ptr<const config::HTTPSPostProfile> profile,
@@ -37,6 +37,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
+  BackendActivity activity() const override;
 
  private:
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
@@ -52,14 +53,14 @@ class HTTPSPostBackend final : public VeltraBackend {
                                        const NumberedMessage& message);
   JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const;
 
-  // Constant after construction.
   platform::Locale& _locale;
   platform::Counters& _counters;
   EventPosts& _posts;
 
   // The session's thread only.
   HTTPSPostState _clientState;
-  bool _evictable = false;  // the user's account knows the batch
+  // The batch is registered with the user's account.
+  bool _evictable = false;
 
   const std::shared_ptr<HeldEvents> _held;
 };

@@ -1,4 +1,4 @@
-// Whether and how the back end reports for the current client.
+// Applies the decision on a client entry to the back end.
 #include "backends/https/https_post_state.h"
 
 #include <algorithm>
@@ -6,7 +6,6 @@
 #include "backends/https/text_lists.h"
 #include "formats/json.h"
 #include "platform/counters.h"
-#include "platform/locale.h"
 #include "platform/log.h"
 #include "wire/constants.h"
 
@@ -18,7 +17,7 @@ std::optional<std::string> optionalText(const std::string* text) {
 }
 }  // namespace
 
-std::int32_t HTTPSPostState::updateBackendState() {
+StateVerdict HTTPSPostState::updateBackendState() {
   const auto facts = _backEnd.facts();
   const SharedDictionary& userInfo = facts->userInfo;
   const auto clientName =
@@ -32,27 +31,26 @@ std::int32_t HTTPSPostState::updateBackendState() {
   const bool found = entry != clients.end();
   if (found) applyExpedite(*entry);
   if (!facts->requireUserInfo) return reportForEveryone();
-  if (!userInfo) {
-    _counters.count(wire::Reason::waits_for_user_info);
-    return kBackendWaiting;
-  }
-  if (!found) {
-    _counters.count(wire::Reason::no_entry);
-    return kBackendDisabled;
-  }
+  if (!userInfo) return counted(kBackendWaiting, wire::Reason::waits_for_user_info);
+  if (!found) return counted(kBackendDisabled, wire::Reason::no_entry);
   return reportForClient(*entry, clientName, serviceName);
 }
 
-std::int32_t HTTPSPostState::reportForEveryone() {
+StateVerdict HTTPSPostState::reportForEveryone() {
   const auto& clients = *_profile->clients;
   const auto taken =
       std::find_if(clients.begin(), clients.end(),
                    [this](const config::ClientEntry& candidate) { return _links.updatePostLink(candidate); });
   resetBackendStateWithClient(taken == clients.end() ? nullptr : &*taken);
-  return kBackendReporting;
+  return {kBackendReporting, wire::Reason::no_user_info_required};
 }
 
-std::int32_t HTTPSPostState::reportForClient(const config::ClientEntry& entry,
+StateVerdict HTTPSPostState::counted(std::int32_t state, wire::Reason reason) {
+  _counters.count(reason);
+  return {state, reason};
+}
+
+StateVerdict HTTPSPostState::reportForClient(const config::ClientEntry& entry,
                                              const std::optional<std::string>& clientName,
                                              const std::optional<std::string>& serviceName) {
   const auto country = _locale.countryCode();
@@ -67,12 +65,12 @@ std::int32_t HTTPSPostState::reportForClient(const config::ClientEntry& entry,
     logRefusal(entry, verdict, country);
     _counters.count(*verdict.reason);
   }
-  if (!verdict.samplingReached) return kBackendDisabled;
+  const wire::Reason reason = verdict.reason.value_or(wire::Reason::reports);
+  if (!verdict.samplingReached) return {kBackendDisabled, reason};
 
   resetBackendStateWithClient(&entry);
   if (entry.customClientID && !_identity.takeCustomClientID(clientName, serviceName)) {
-    _counters.count(wire::Reason::no_identifier);
-    return kBackendDisabled;
+    return counted(kBackendDisabled, wire::Reason::no_identifier);
   }
   logDebug(
       "HTTPSPostBackend(updateBackendState): %s: client found %s:%s, state=%d, samplingFactor=%f, "
@@ -81,7 +79,7 @@ std::int32_t HTTPSPostState::reportForClient(const config::ClientEntry& entry,
       serviceName ? serviceName->c_str() : "(null)", verdict.state, _backEnd.samplingFactor(),
       verdict.hierarchy);
   _links.updatePostLink(entry);
-  return verdict.state;
+  return {verdict.state, reason};
 }
 
 void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
@@ -111,7 +109,7 @@ void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVe
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;
     default:
-      break;  // the line of the state says it
+      break;
   }
 }
 

@@ -13,15 +13,12 @@
 #include "backends/https/post_identity.h"
 #include "backends/https/post_links.h"
 #include "config/storebag_content.h"
-
-namespace veltrad::platform {
-class Locale;
-}  // namespace veltrad::platform
+#include "platform/locale.h"
 
 namespace veltrad::backends {
 
-// Part of its back end, which it reads the facts from, and tells hierarchy and sampling
-// threshold. What a run does not reach stays as an earlier one has left it.
+// Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. What an
+// update does not reach keeps its earlier value.
 class HTTPSPostState {
  public:
   // `profile` has "clients".
@@ -35,8 +32,8 @@ class HTTPSPostState {
         _identity(identity),
         _links(identity.preferences) {}
 
-  // The state (BackendState) for the present user info.
-  std::int32_t updateBackendState();
+  // The state for the present user info.
+  StateVerdict updateBackendState();
 
   bool batchEvents(const SessionFacts& facts) const { return _batchEvents.value_or(facts.batchEvents); }
   const PostIdentity& identity() const { return _identity; }
@@ -47,15 +44,15 @@ class HTTPSPostState {
 
  private:
   void applyExpedite(const config::ClientEntry& entry);
-  std::int32_t reportForEveryone();
-  std::int32_t reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
+  StateVerdict counted(std::int32_t state, wire::Reason reason);
+  StateVerdict reportForEveryone();
+  StateVerdict reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
                                const std::optional<std::string>& serviceName);
   void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
                   const std::optional<std::string>& country) const;
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
   void resetBackendStateWithClient(const config::ClientEntry* entry);
 
-  // Constant after construction.
   VeltraBackend& _backEnd;
   const std::shared_ptr<const config::HTTPSPostProfile> _profile;
   platform::Locale& _locale;
@@ -64,7 +61,8 @@ class HTTPSPostState {
   PostIdentity _identity;
   PostLinks _links;
   FilterTable _filters;
-  std::optional<bool> _batchEvents;  // an entry's "expedite"
+  // From an entry's "expedite".
+  std::optional<bool> _batchEvents;
   std::int32_t _eventThreshold = 49;
   std::optional<double> _overrideSampling;
 };

@@ -1,4 +1,4 @@
-// Envelope making.
+// Makes the envelope.
 #include "backends/https/json_message.h"
 
 #include <fmt/format.h>
@@ -22,7 +22,7 @@ Fate fateOf(const Value& value) {
     case Value::Type::string:
       return Fate::keep;
     case Value::Type::real:
-      return value.toDouble() ? Fate::keep : Fate::remove;  // absent: not finite
+      return value.toDouble() ? Fate::keep : Fate::remove;
     case Value::Type::date:
       return Fate::toSeconds;
     case Value::Type::data:
@@ -33,7 +33,7 @@ Fate fateOf(const Value& value) {
   return Fate::remove;
 }
 
-// For a log line, which need not hold a mebibyte.
+// Limits the length of a log line.
 constexpr std::size_t kMostPrinted = 1024;
 
 std::string cut(const std::string& text) {
@@ -43,16 +43,16 @@ std::string cut(const std::string& text) {
 }
 
 std::string printed(const Value& value) {
-  if (const double* number = value.asReal()) return fmt::format("{}", *number);  // "nan", "inf"
+  if (const double* number = value.asReal()) return fmt::format("{}", *number);
   const formats::JSONExcerpt excerpt = formats::excerptOfJSON(value, kMostPrinted);
   return excerpt.leftOut == 0 ? excerpt.text
                               : fmt::format("{}… ({} bytes cut)", excerpt.text, excerpt.leftOut);
 }
+}  // namespace
 
 double finiteOrMinusOne(double seconds) {
   return std::isfinite(seconds) ? seconds : -1.0;
 }
-}  // namespace
 
 std::size_t restrictEventForJSON(Dictionary& event) {
   std::vector<Dictionary::Entry> changed;
@@ -66,7 +66,7 @@ std::size_t restrictEventForJSON(Dictionary& event) {
     }
     changed.emplace_back(key, value);
   }
-  // Applied after the walk, which they must not disturb.
+  // Changes are applied after the loop, which they would invalidate.
   std::size_t removed = 0;
   for (auto& [key, value] : changed) {
     if (const Date* date = value.asDate()) {

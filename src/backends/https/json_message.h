@@ -1,4 +1,4 @@
-// The JSON envelope that is posted, and its readable copy. Plain functions; any thread.
+// Makes the JSON text that is posted, and its readable copy.
 #pragma once
 
 #include <optional>
@@ -9,18 +9,22 @@
 
 namespace veltrad::backends {
 
-// What JSON cannot carry is taken out of an event, in place: a date becomes its seconds since 1970 (-1.0 if
-// not finite); lists, dictionaries, raw bytes and numbers that are not finite are removed, each with one
-// warning line. Returns how many entries were removed.
+// JSON cannot represent numbers that are not finite.
+double finiteOrMinusOne(double seconds);
+
+// Changes an event in place so that JSON can represent it. A date becomes its seconds since 1970 (-1.0 if not
+// finite). Lists, dictionaries, raw bytes and numbers that are not finite are removed, each with a warning
+// line. Returns how many entries were removed.
 std::size_t restrictEventForJSON(Dictionary& event);
 
 struct JSONMessage {
   std::string compact;
-  std::optional<std::string> pretty;  // only where it was wanted
+  // Only if it was requested.
+  std::optional<std::string> pretty;
 };
 
-// {"postTime": seconds since 1970, "clientId": text, "events": [...]}. The events are restricted already.
-// `postTime` that is not finite is written as -1.0.
+// {"postTime": seconds since 1970, "clientId": text, "events": [...]}. The events have been restricted. A
+// `postTime` that is not finite becomes -1.0.
 JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
                             bool wantPretty);
 

@@ -1,14 +1,11 @@
-// Consent and identifiers from the preferences and the library.
+// Reads consent and identifiers from the preferences and the library.
 #include "backends/https/post_identity.h"
 
 #include <string_view>
 
 #include "backends/session_facts.h"
-#include "config/process_settings.h"
 #include "platform/log.h"
-#include "platform/preferences.h"
 #include "platform/uuid.h"
-#include "support/veltra.h"
 
 namespace veltrad::backends {
 
@@ -18,7 +15,7 @@ bool diagnosticLogSubmissionEnabled(platform::Preferences& preferences) {
   return consent && consent->toBoolean().value_or(false);
 }
 
-// True when the text, after blanks, a sign and zeros, begins with Y, y, T, t or a digit 1 to 9.
+// True if the text, after blanks, a sign and zeros, begins with Y, y, T, t or a digit from 1 to 9.
 bool textMeansYes(const std::optional<std::string>& text) {
   if (!text) return false;
   std::size_t at = text->find_first_not_of(" \t\n\v\f\r");
@@ -66,7 +63,7 @@ const std::string& PostIdentity::clientIdentifier(const DeviceFacts& device) con
 bool PostIdentity::loggingAllowed() const {
   if (_dnuType == 0 && _dnuEnabled) return true;
   if (!_forceEventLogging) return false;
-  const auto environment = _settings.currentEnvironment();  // nothing: for now nobody can say
+  const auto environment = _settings.currentEnvironment();
   return environment == 1 || environment == 2;
 }
 

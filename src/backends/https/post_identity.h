@@ -1,21 +1,13 @@
-// Under which identifier a back end posts, and what the user's consent allows. Its owner's thread.
+// The identifier under which a back end posts, and what the user's consent allows.
 #pragma once
 
 #include <cstdint>
 #include <optional>
 #include <string>
 
-namespace veltrad::config {
-class ProcessSettings;
-}  // namespace veltrad::config
-
-namespace veltrad::platform {
-class Preferences;
-}  // namespace veltrad::platform
-
-namespace veltrad::support {
-class Veltra;
-}  // namespace veltrad::support
+#include "config/process_settings.h"
+#include "platform/preferences.h"
+#include "support/veltra.h"
 
 namespace veltrad::backends {
 
@@ -23,7 +15,7 @@ struct DeviceFacts;
 
 class PostIdentity {
  public:
-  // Where it learns what it needs; outlives it.
+  // All of it outlives the object.
   struct Sources {
     platform::Preferences& preferences;
     const support::Veltra& library;
@@ -31,21 +23,20 @@ class PostIdentity {
   };
   explicit PostIdentity(const Sources& sources);
 
-  // False: the device's identifiers could not be read.
+  // False if the device's identifiers could not be read.
   bool known() const { return !_uuidRespectDnu.empty() && !_uuidOverrideDnu.empty(); }
   bool consent() const { return _dnuEnabled; }
-  // 0 consent respected; overridden: 1 without consent, 2 with it.
+  // As in ClientVerdict.
   std::int32_t dnuType() const { return _dnuType; }
   void setDNUType(std::int32_t value) { _dnuType = value; }
-  // Other than 0: an internal build posts under the device's own identifier.
+  // If it is not 0, an internal build posts under the device's own identifier.
   void setExtrasOnInternal(std::int32_t value) { _extrasOnInternal = value; }
-  // From now on under the identifier of this client and service; false: it cannot be read, and another would
-  // be no better than a wrong one.
+  // From now on posts use the identifier of this client and service. False if it cannot be read.
   bool takeCustomClientID(const std::optional<std::string>& clientName,
                           const std::optional<std::string>& serviceName);
 
   const std::string& clientIdentifier(const DeviceFacts& device) const;
-  // Whether a readable copy of a post may be made.
+  // Whether a readable copy of a post may be logged.
   bool loggingAllowed() const;
 
  private:

@@ -1,8 +1,7 @@
-// Post addresses from the preferences and from client entries.
+// Reads post URLs from the preferences and from client entries.
 #include "backends/https/post_links.h"
 
 #include "platform/log.h"
-#include "platform/preferences.h"
 
 namespace veltrad::backends {
 

@@ -1,15 +1,11 @@
-// Where a back end's events are posted to: as the preferences say, else as a client entry does. Its owner's
-// thread.
+// The URLs to which a back end posts: from the preferences, else from a client entry.
 #pragma once
 
 #include <optional>
 #include <string>
 
 #include "config/client_entry.h"
-
-namespace veltrad::platform {
-class Preferences;
-}  // namespace veltrad::platform
+#include "platform/preferences.h"
 
 namespace veltrad::backends {
 
@@ -17,7 +13,7 @@ class PostLinks {
  public:
   explicit PostLinks(platform::Preferences& preferences);
 
-  // True when the entry's "post_url" was taken.
+  // Returns whether the entry's "post_url" was used.
   bool updatePostLink(const config::ClientEntry& entry);
   const std::optional<std::string>& postURL() const { return _postURL; }
   const std::optional<std::string>& realtimePostURL() const { return _realtimePostURL; }
@@ -25,7 +21,7 @@ class PostLinks {
  private:
   std::optional<std::string> _postURL;
   std::optional<std::string> _realtimePostURL;
-  // From the preferences, so that no entry replaces it.
+  // The URL is from the preferences, so no entry replaces it.
   const bool _useDefaultPostURL;
   const bool _useDefaultRealtimePostURL;
 };

@@ -1,4 +1,4 @@
-// Headers and body of a post.
+// Makes the headers and the body of a post.
 #include "backends/https/post_request.h"
 
 #include <fmt/format.h>

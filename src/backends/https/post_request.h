@@ -1,4 +1,4 @@
-// The HTTPS request of one post. Plain functions; any thread.
+// Makes the HTTPS request of a post and evaluates the status of its answer.
 #pragma once
 
 #include <cstdint>
@@ -12,21 +12,20 @@ namespace veltrad::backends {
 
 struct SessionFacts;
 
-// What a single event's post says of it in "X-VLT-Event-Map"; a flush has none.
+// The content of "X-VLT-Event-Map", for a post of a single event only.
 struct EventMap {
   std::uint16_t method;
   std::uint16_t responseCode;
 };
 
-// A POST of the JSON bytes, compressed when that is strictly shorter, with the headers that name the client,
-// the sender and the daemon. A text that is absent in "User-Agent" is "(null)".
+// Compresses the JSON text if that makes it shorter. In "User-Agent", "(null)" stands for an absent text.
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
                                   std::optional<EventMap> eventMap);
 
-// What an answer's status means for the backend and for the events of the post.
+// What an answer's status means for the back end and for the posted events.
 struct PostVerdict {
-  bool disablesBackend;  // 5xx
-  wire::Reason reason;   // of the events' fate
+  bool disablesBackend;
+  wire::Reason reason;
 };
 PostVerdict verdictOfStatus(int status);
 

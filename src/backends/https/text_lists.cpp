@@ -1,4 +1,4 @@
-// List matching.
+// Matches texts with lists.
 #include "backends/https/text_lists.h"
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-// How names are held against lists of texts: letter case ignored. Plain functions; any thread.
+// Compares names with lists of texts, ignoring letter case.
 #pragma once
 
 #include <optional>
@@ -9,15 +9,15 @@
 
 namespace veltrad::backends {
 
-// Absent or empty list: `whitelist`. Absent text with a list: the opposite. Else whether an item equals the
-// text.
+// Returns whether an item equals the text; `whitelist` if the list is empty; `!whitelist` if the text is
+// absent.
 bool matchExactStringWithList(const std::vector<std::string>& list,
                               const std::optional<std::string>& wholeString, bool whitelist);
-// The same, but whether an item occurs inside the text.
+// The same, but an item matches if it occurs in the text.
 bool matchStringWithList(const std::vector<std::string>& list, const std::optional<std::string>& wholeString,
                          bool whitelist);
 
-// An entry's "client" (exact) and "service" (substring); an entry without both matches every client.
+// Compares an entry's "client" (exact) and "service" (substring). An entry without both matches every client.
 bool matchClientNameAndServiceID(const config::ClientEntry& entry,
                                  const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID);

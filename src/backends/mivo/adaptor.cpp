@@ -1,4 +1,4 @@
-// The adaptor bundle's table read, and its functions called; what they throw stays here. See adaptor.h.
+// Reads the table of an adaptor bundle and calls its functions.
 #include "backends/mivo/adaptor.h"
 
 #include <fmt/format.h>
@@ -15,7 +15,7 @@ namespace {
 
 constexpr const char* kTable = "veltra_adaptor";
 
-// Nothing, or what `call` threw.
+// Returns what `call` threw, if it did.
 template <typename Call>
 std::optional<std::string> thrownBy(Call call) {
   try {

@@ -1,5 +1,4 @@
-// The adaptor of a bundle: its class found by name, one instance of it, its operations found by selector. An
-// instance: one thread at a time.
+// An adaptor of a code bundle: its class, found by name, and an instance with its operations.
 #pragma once
 
 #include <veltra/adaptor.h>
@@ -16,21 +15,22 @@ namespace veltrad::backends {
 
 class CodeBundle;
 
-// The class of that name, or what is wrong with the bundle. Any thread.
+// Returns the class of that name, or what is wrong with the bundle. Any thread.
 Result<const veltra_adaptor_class*, std::string> adaptorClassNamed(CodeBundle& bundle, std::string_view name);
 
-// One instance. Whatever the bundle's code throws ends here.
+// One instance, for one thread at a time. Catches whatever the bundle's code throws.
 class Adaptor {
  public:
-  // Null and the reason in `failure`: the class has made none.
+  // Null if the class made no instance; `failure` then says why.
   static std::unique_ptr<Adaptor> make(const veltra_adaptor_class& ofClass, std::string& failure);
   ~Adaptor();
   Adaptor(const Adaptor&) = delete;
   Adaptor& operator=(const Adaptor&) = delete;
 
-  std::string description() const;  // "<MivoAdaptor: 0x55d0c8>"
+  // For example "<MivoAdaptor: 0x55d0c8>".
+  std::string description() const;
   bool respondsToSelector(std::string_view selector) const { return operationNamed(selector) != nullptr; }
-  // Nothing, or what it threw. It must respond to the selector.
+  // Returns what the operation threw, if it did. The adaptor must respond to the selector.
   std::optional<std::string> perform(std::string_view selector, std::uint16_t method, std::uint16_t respCode,
                                      const Dictionary* payload);
 
@@ -38,7 +38,6 @@ class Adaptor {
   Adaptor(const veltra_adaptor_class& ofClass, void* instance) : _class(ofClass), _instance(instance) {}
   const veltra_adaptor_operation* operationNamed(std::string_view selector) const;
 
-  // Constant after construction.
   const veltra_adaptor_class& _class;
   void* const _instance;
 };

@@ -1,4 +1,4 @@
-// From values to an adaptor's plain structures. Any thread.
+// Converts values into the structures of veltra/adaptor.h.
 #include "backends/mivo/adaptor_payload.h"
 
 #include <utility>

@@ -1,4 +1,4 @@
-// A message's payload as an adaptor sees it. A plain value; the thread that made it.
+// A message's payload in the form that adaptors take.
 #pragma once
 
 #include <veltra/adaptor.h>
@@ -10,8 +10,8 @@
 
 namespace veltrad::backends {
 
-// A tree of the plain structures of veltra/adaptor.h. Texts and data stay the dictionary's, which outlives
-// it.
+// A tree of the structures of veltra/adaptor.h. It refers to the dictionary's texts and data, so the
+// dictionary outlives it.
 class AdaptorPayload {
  public:
   explicit AdaptorPayload(const Dictionary* payload);
@@ -25,7 +25,7 @@ class AdaptorPayload {
   veltra_adaptor_value valueOf(const Array& array);
   veltra_adaptor_value valueOf(const Dictionary& dictionary);
 
-  // What values point at: a deque does not move its elements.
+  // The values point into these. A deque does not move its elements.
   std::deque<std::vector<veltra_adaptor_value>> _items;
   std::deque<std::vector<veltra_adaptor_entry>> _entries;
   bool _present;

@@ -1,4 +1,4 @@
-// Code loaded with dlopen, once it is clear whose it is. Any thread.
+// Checks who could have written the code, and loads it.
 #include "backends/mivo/code_bundle.h"
 
 #include <dlfcn.h>
@@ -26,7 +26,7 @@ std::string loaderText(const std::string& file) {
   return text ? text : file + ": cannot be loaded";
 }
 
-// A link's own mode says nothing: who may change it is who may write its directory.
+// The mode of a link does not matter: whoever may write its directory may change it.
 bool isTrusted(const struct stat& status) {
   const bool ours = status.st_uid == 0 || status.st_uid == ::geteuid();
   const bool sticky = S_ISDIR(status.st_mode) && (status.st_mode & S_ISVTX) != 0;
@@ -42,15 +42,16 @@ std::string reasonToDistrust(const std::string& path, const struct stat& status)
          "and writable by nobody else";
 }
 
-using Parts = std::vector<std::string>;  // the next one last
+// The parts of a path in reverse order.
+using Parts = std::vector<std::string>;
 
 void putInFront(Parts& parts, const std::filesystem::path& path) {
   const Parts names(path.begin(), path.end());
   parts.insert(parts.end(), names.rbegin(), names.rend());
 }
 
-// The file that an absolute path leads to, once each step of the way was looked at; else why somebody else
-// could have put code there.
+// Follows an absolute path step by step and returns the file that it leads to, or why others could have put
+// code there.
 Result<std::string, std::string> trustedFile(const std::filesystem::path& file) {
   Parts left;
   putInFront(left, file);

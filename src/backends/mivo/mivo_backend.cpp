@@ -1,19 +1,10 @@
-// The adaptor's back end. The session's thread.
+// Passes messages to the adaptor.
 #include "backends/mivo/mivo_backend.h"
 
 #include "platform/counters.h"
 #include "platform/log.h"
 
 namespace veltrad::backends {
-
-namespace {
-constexpr std::uint32_t kAllowedClientTypes = 0x2880;  // a bit a type
-constexpr std::int32_t kHighestClientType = 13;
-}  // namespace
-
-bool MivoBackend::isClientTypeAllowed(std::int32_t clientType) {
-  return clientType >= 0 && clientType <= kHighestClientType && (kAllowedClientTypes >> clientType & 1) != 0;
-}
 
 std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platform::Counters& counters,
                                                        platform::Random& random, const std::string& name,

@@ -1,5 +1,5 @@
-// MivoBackend: every message goes to the adaptor that the system's bundle brings. The session's thread, which
-// the adaptor holds until it has the message.
+// MivoBackend: passes every message to the adaptor of the system's bundle, on the session's thread, which
+// waits for it.
 #pragma once
 
 #include <veltra/adaptor.h>
@@ -12,18 +12,18 @@
 
 namespace veltrad::backends {
 
-// For client types 7, 11 and 13. Where the bundle or its class is missing there is a back end all the same,
-// without an adaptor: each of its messages is one error line. The bundle outlives it.
+// If the bundle or its class is missing, the back end has no adaptor and logs an error for each message. The
+// bundle outlives it.
 class MivoBackend final : public VeltraBackend {
  public:
-  // Null for a client type that has no adaptor; one error line has said so.
+  // Null, after one error line, if the client type has no adaptor.
   static std::shared_ptr<MivoBackend> initWithName(CodeBundle& bundle, platform::Counters& counters,
                                                    platform::Random& random, const std::string& name,
                                                    const std::string& productFamily, std::int32_t clientType);
 
-  static bool isClientTypeAllowed(std::int32_t clientType);
+  static bool isClientTypeAllowed(std::int32_t clientType) { return isAdaptorClientType(clientType); }
 
-  // Nothing, always. Payload, method and response code are handed on as they are.
+  // Passes on the payload, the method and the response code. Returns no text.
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
 
  private:
@@ -31,10 +31,9 @@ class MivoBackend final : public VeltraBackend {
               const std::string& name, const std::string& productFamily);
   void loadAdaptor();
 
-  // Constant after initialisation.
   platform::Counters& _counters;
   CodeBundle& _clientBundle;
-  std::unique_ptr<Adaptor> _mivoAdaptor;  // null: none could be had
+  std::unique_ptr<Adaptor> _mivoAdaptor;
 };
 
 }  // namespace veltrad::backends

@@ -1,4 +1,4 @@
-// O_TMPFILE where the file system has it: a file that nobody sees, and that ends with the process.
+// Uses O_TMPFILE where the file system has it, so the file never has a name.
 #include "backends/upload/compressed_file.h"
 
 #include <fcntl.h>
@@ -24,7 +24,7 @@ bool CompressedFile::append(std::string_view bytes) {
 bool CompressedFile::open() {
   FileDescriptor file(::open(_directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
   if (!file.isOpen() && (errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL || errno == ENOENT)) {
-    // A kill between the two calls leaves a name that is removed at the next start.
+    // If the process is killed between the two calls, the next start removes the file.
     std::string name = _directory + "/upload-XXXXXX.new";
     file.reset(::mkostemps(name.data(), 4, O_CLOEXEC));
     if (file.isOpen()) ::unlink(name.c_str());

@@ -1,5 +1,4 @@
-// What a file's compression makes, until it has been sent: in memory while it is small, else in a file that
-// has no name. One thread at a time.
+// The compressed form of a file: in memory while it is small, else in a file that has no name.
 #pragma once
 
 #include <cstdint>
@@ -16,12 +15,12 @@ class CompressedFile {
  public:
   static constexpr std::size_t kMostInMemory = 256u << 10;
 
-  // Of a directory on a disk with room, where files may be made.
+  // `directory`: where files can be made.
   explicit CompressedFile(std::string directory) : _directory(std::move(directory)) {}
 
-  // False: there is no room, and errno says why. Nothing stays behind.
+  // False if there is no room; errno says why. Leaves no file behind.
   bool append(std::string_view bytes);
-  // Moves all that was appended into the request.
+  // Moves the content into the request.
   void become(http::HTTPRequest& request);
 
  private:

@@ -1,4 +1,4 @@
-// fstat and pread, nothing that depends on a path. One thread at a time.
+// Uses fstat and pread only, which do not depend on a path.
 #include "backends/upload/file_snapshot.h"
 
 #include <unistd.h>
@@ -31,7 +31,8 @@ std::optional<std::size_t> FileSnapshot::read(char* place, std::size_t room) {
 
 std::optional<std::size_t> FileSnapshot::readAt(off_t at, char* place, std::size_t room) const {
   room = std::min(room, static_cast<std::size_t>(_size - at));
-  if (room == 0) return 0;  // not even asked: some files of the kernel's have no size, and reading them waits
+  // Some files of the kernel have no size, and reading them would block.
+  if (room == 0) return 0;
   ssize_t count;
   do {
     count = ::pread(_descriptor, place, room, at);

@@ -1,4 +1,4 @@
-// A file as it is when its upload begins, read through a descriptor. One thread at a time.
+// A file in the state at the beginning of its upload, read through a descriptor.
 #pragma once
 
 #include <sys/stat.h>
@@ -8,24 +8,24 @@
 
 namespace veltrad::backends {
 
-// The daemon reads nothing but the bytes that were there at the beginning, whatever becomes of the file: one
-// that grows has no end, and one that others shorten must not be mapped.
+// Reads only the bytes that were there at the beginning, because a file may grow without end. Does not map
+// the file, because others may shorten it.
 class FileSnapshot {
  public:
-  // zlib and the system's calls count so far.
-  static constexpr off_t kMostBytes = 0x7fffffff;  // 2 GiB - 1
+  // 2 GiB - 1, the limit of zlib and of system calls.
+  static constexpr off_t kMostBytes = 0x7fffffff;
 
-  // Nothing: `descriptor` is none, or not that of a regular file. It stays the caller's and outlives this.
+  // Nothing if it is not a regular file. The descriptor stays the caller's and outlives this object.
   static std::optional<FileSnapshot> of(int descriptor);
 
   off_t size() const { return _size; }
   enum class Content { some, none, unreadable };
-  // By its first byte; where it is unreadable errno says why.
+  // Tries to read the first byte. If it is unreadable, errno says why.
   Content content() const;
-  // At most `room` bytes from where the last call ended; 0 at the end, which a file that was shortened has
-  // early. Nothing: it cannot be read, and errno says why.
+  // Reads at most `room` bytes from where the last call ended. Returns 0 at the end, which comes early if the
+  // file was shortened; nothing if it cannot be read, and errno says why.
   std::optional<std::size_t> read(char* place, std::size_t room);
-  // The file is no longer what it was at the beginning, or has ended before the size that it has.
+  // Whether the file has changed since the beginning, or ended early.
   bool changed() const;
 
  private:

@@ -1,4 +1,4 @@
-// How many files are uploaded at one time. Any thread.
+// Limits how many files are uploaded at the same time. Any thread.
 #pragma once
 
 #include <chrono>
@@ -13,16 +13,16 @@
 
 namespace veltrad::backends {
 
-// One for all upload back ends, which it outlives: an upload holds a place, its buffers and its compressed
-// file from the first byte read to the server's answer. One user never holds all places.
+// One object serves all upload back ends, which it outlives. An upload holds a place from the first byte read
+// until the server's answer. One user never holds all places.
 class FileUploads {
  public:
   static constexpr std::size_t kMostAtOnce = 3;
   static constexpr std::size_t kMostOfOneUser = 2;
-  // Who has no account counts as one user.
+  // All clients without an account count as one user.
   using User = std::optional<unsigned>;
 
-  // Gives the place back at its end.
+  // Its destructor frees the place.
   class Place {
    public:
     Place(FileUploads& uploads, User user) : _uploads(&uploads), _user(user) {}
@@ -37,16 +37,16 @@ class FileUploads {
     User _user;
   };
 
-  // Waits for a place: first come, first served, but nobody waits for a user who has his share. Nothing: the
-  // daemon is stopping, which ends the wait even if no place is ever given back.
+  // Waits for a place. Places are given in order of arrival, passing over users that have their share.
+  // Nothing if the daemon is stopping.
   std::optional<Place> enter(User user, const http::HTTPClient& http) {
     const auto self = arrive(user);
     while (true) {
-      const bool stopping = http.stopping();  // takes a lock of its own
+      const bool stopping = http.stopping();
       const Lock held(_mutex);
       if (stopping || isNext(self)) {
         _waiting.erase(self);
-        _changed.notifyAll();  // the next may enter, too
+        _changed.notifyAll();
         if (stopping) return std::nullopt;
         ++_underWay;
         ++_ofUser[user];
@@ -86,7 +86,8 @@ class FileUploads {
   Condition _changed;
   std::size_t _underWay GUARDED_BY(_mutex) = 0;
   std::map<User, std::size_t> _ofUser GUARDED_BY(_mutex);
-  Waiting _waiting GUARDED_BY(_mutex);  // in order of arrival
+  // In order of arrival.
+  Waiting _waiting GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::backends

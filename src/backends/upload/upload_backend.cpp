@@ -1,17 +1,14 @@
-// From a lent file to the server's answer. The session's thread.
+// Compresses and posts a lent file, and handles the server's answer.
 #include "backends/upload/upload_backend.h"
 
 #include <cerrno>
 #include <cstring>
 
 #include "backends/upload/compressed_file.h"
-#include "backends/upload/file_snapshot.h"
 #include "backends/upload/file_uploads.h"
 #include "backends/upload/upload_request.h"
 #include "base/text.h"
-#include "http/http_client.h"
 #include "platform/counters.h"
-#include "platform/lent_files.h"
 #include "platform/log.h"
 #include "platform/memory_budget.h"
 #include "support/gzip.h"
@@ -20,14 +17,14 @@ namespace veltrad::backends {
 
 namespace {
 
-// What a server's answer holds where it has stored the file.
+// The server's answer contains this if it has stored the file.
 constexpr std::string_view kConfirmation = "success";
 
 FileUploads::User userOf(const std::shared_ptr<platform::MemoryAccount>& account) {
   return account ? FileUploads::User(account->uid()) : std::nullopt;
 }
 
-// Of an exchange that ended without an answer.
+// The reason for an exchange that ended without an answer.
 wire::Reason fateAfter(http::HTTPError::Kind kind) {
   switch (kind) {
     case http::HTTPError::Kind::transport:
@@ -96,7 +93,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   return true;
 }
 
-// Nothing: it cannot be uploaded, which has been said and counted.
+// Nothing if the file cannot be uploaded, which is logged and counted.
 std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile* lent,
                                                         const std::string& path) const {
   if (comesFromOthers(lent, path)) return std::nullopt;
@@ -121,7 +118,7 @@ std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile
   return std::nullopt;
 }
 
-// A program that serves a file need not answer, and even a look at the file would wait for it.
+// On such a file system even fstat may block forever.
 bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::string& path) const {
   if (!lent) return false;
   const auto origin = lent->origin();
@@ -134,7 +131,7 @@ bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::s
   return true;
 }
 
-// False: it failed, which has been said and counted.
+// Logs and counts a failure.
 bool UploadBackend::compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const {
   std::optional<wire::Reason> fate = wire::Reason::file_not_compressed;
   const auto next = [&](char* bytes, std::size_t room) -> std::optional<std::size_t> {
@@ -167,7 +164,7 @@ void UploadBackend::sayStopping() const {
   _counters.count(wire::Reason::file_stopped);
 }
 
-// Says and counts how the exchange ended, too.
+// Also logs and counts how the exchange ended.
 bool UploadBackend::confirms(const http::HTTPResult& answer) const {
   if (!answer.ok() || answer.value().body.empty()) {
     logError("UploadBackend(uploadFileAtPath): post %s",

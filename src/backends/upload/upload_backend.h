@@ -1,5 +1,5 @@
-// UploadBackend: one file of the client, gzipped, to the upload server. The session's thread runs all of it
-// and waits for the server.
+// UploadBackend: compresses files of the client and posts them to the upload server. The session's thread
+// does all of it and waits for the server.
 #pragma once
 
 #include <memory>
@@ -10,39 +10,35 @@
 #include "backends/upload/file_snapshot.h"
 #include "config/storebag_content.h"
 #include "http/http_client.h"
-
-namespace veltrad::platform {
-class LentFile;
-class LentFiles;
-}  // namespace veltrad::platform
+#include "platform/lent_files.h"
 
 namespace veltrad::backends {
 
 class CompressedFile;
 class FileUploads;
 
-// What an upload back end is made from. Everything outlives it.
+// What an upload back end uses. The references outlive it.
 struct UploadMaking {
   platform::Random& random;
   FileUploads& uploads;
   http::HTTPClient& http;
   platform::LentFiles& lentFiles;
   platform::Counters& counters;
-  std::string scratchDirectory;  // for files without a name
+  std::string scratchDirectory;
 };
 
-// Keeps nothing between uploads but its address. Sees a file through the descriptor that its client lent,
-// never by a path. Takes no part in message reporting.
+// Reads a file through the descriptor that its client lent, never by its path. Takes no part in message
+// reporting.
 class UploadBackend final : public VeltraBackend {
  public:
-  // From a storebag's section: "post_url" (without a query), and where given "display_url". Null, after one
-  // error line, without the first.
+  // From a storebag's section: "post_url" (without a query) and optionally "display_url". Null, after one
+  // error line, without "post_url".
   static std::shared_ptr<UploadBackend> initWithName(const UploadMaking& making, const std::string& name,
                                                      const config::UploadProfile* profile,
                                                      const std::string& productFamily);
 
-  // True when the request was carried out, whatever became of it: the answer alone decides whether the client
-  // is asked to remove its file. Error lines say why it was not.
+  // True if the request was made, whatever the result: only the answer decides whether the client is asked to
+  // remove its file. Otherwise an error line says why not.
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
 
  private:
@@ -56,7 +52,6 @@ class UploadBackend final : public VeltraBackend {
   void sayStopping() const;
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
-  // Constant after construction.
   FileUploads& _uploads;
   http::HTTPClient& _http;
   platform::LentFiles& _lentFiles;

@@ -1,4 +1,4 @@
-// Address and headers of an upload. Pure functions; any thread.
+// Makes the address and the headers of an upload.
 #include "backends/upload/upload_request.h"
 
 #include <fmt/printf.h>
@@ -10,14 +10,14 @@ namespace veltrad::backends {
 namespace {
 
 constexpr std::uint32_t kLeastBytesPerSecond = 1024;
-// Of the answer, which goes to the log as it is.
+// The answer is written to the log.
 constexpr std::size_t kMostAnswerBytes = 1u << 20;
 constexpr std::string_view kDescription = "Callwyn QBSL log";
 
-// Beside letters, digits and "-._~" (RFC 3986, 3.4).
+// Besides letters, digits and "-._~" (RFC 3986, 3.4).
 constexpr std::string_view kKeptInQuery = "!$&'()*+,;=:@/?";
 
-// Whether all of it may stand in a URL; how it is put together is the HTTP client's to judge.
+// Whether all characters may occur in a URL. The HTTP client checks the rest.
 bool mayBeURL(std::string_view text) {
   return percentEncoded(text, std::string(kKeptInQuery) + "%#[]") == text;
 }

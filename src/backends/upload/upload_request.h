@@ -1,4 +1,4 @@
-// The request that carries a file. Pure functions; any thread.
+// Makes the request that posts a file.
 #pragma once
 
 #include <cstdint>
@@ -10,10 +10,10 @@
 
 namespace veltrad::backends {
 
-// What stands behind the last slash; slashes at the end do not count. "/" of the root.
+// The part after the last slash, not counting slashes at the end. "/" for the root.
 std::string_view lastPathComponent(std::string_view path);
 
-// The post of a gzipped file, but for its body. Nothing: `uploadURL` and the rest make no URL.
+// The request for a gzipped file, without its body. Nothing if the URL would not be valid.
 std::optional<http::HTTPRequest> uploadRequest(const std::string& uploadURL, const std::string& udid,
                                                std::uint32_t sessionID, std::string_view path);
 

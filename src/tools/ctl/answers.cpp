@@ -1,5 +1,4 @@
-// What a call was answered, what came beside answers, and the one line that says so. Plain values and pure
-// functions; any thread.
+// Writes answers as JSON.
 #include "tools/ctl/answers.h"
 
 #include <fmt/format.h>

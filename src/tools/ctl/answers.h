@@ -1,5 +1,4 @@
-// What a call was answered, what came beside answers, and the one line that says so. Plain values and pure
-// functions; any thread.
+// The answers to calls and the copies of messages, and the lines that veltractl prints for them.
 #pragma once
 
 #include <cstdint>
@@ -16,32 +15,35 @@
 namespace veltrad::ctl {
 
 struct Answer {
-  veltra_status status = VELTRA_OK;  // anything else: the call ended without an answer, and `error` says why
+  // Unless it is VELTRA_OK, the call ended without an answer, and `error` says why.
+  veltra_status status = VELTRA_OK;
   std::optional<std::string> reply;
   std::optional<std::vector<std::string>> backends;
   std::optional<wire::ReportingError> error;
   bool uploaded = false;
-  bool removed = false;  // an uploaded file
+  // The uploaded file was removed.
+  bool removed = false;
 };
 
-// A copy of a message, for a session that aggregates. All empty: aggregation has ended.
+// A copy of a message, for a session that aggregates. All fields are empty once aggregation has ended.
+// `timestamp` is in seconds since 1970.
 struct AggregatedCopy {
   std::optional<Dictionary> sessionInfo;
-  double timestamp = 0;  // seconds since 1970
+  double timestamp = 0;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   std::optional<Dictionary> payload;
 };
 
-// For a call that never left: the status in words.
+// The answer for a call that was not sent.
 Answer answerOfFailure(veltra_status status);
 
-// JSON without a line break, "op" first. "error" stands in every answer of a flush and of uploaded log data,
-// and in others only when the call ended without an answer.
+// JSON without a line break, "op" first. Answers to a flush and to uploaded log data always have "error";
+// others have it only if the call ended without an answer.
 std::string formatAnswer(Operation operation, const Answer& answer);
 // {"op":"aggregated","sessionInfo":…,"timestamp":…,"category":…,"type":…,"payload":…}; null where absent.
 std::string formatAggregated(const AggregatedCopy& copy);
-// {"op":"error","line":N,"description":"…"}; lines count from 1.
+// {"op":"error","line":N,"description":"…"}; N starts at 1.
 std::string formatMalformedLine(std::uint64_t line, std::string_view description);
 
 }  // namespace veltrad::ctl

@@ -1,4 +1,4 @@
-// One session with the daemon, through the C interface. Own thread only.
+// Makes calls through the C interface and waits for their answers.
 #include "tools/ctl/client_session.h"
 
 #include <sys/eventfd.h>
@@ -100,23 +100,21 @@ std::optional<std::string> ClientSession::create(veltra_session_options& options
 }
 
 std::optional<Answer> ClientSession::start() {
-  return await([this](veltra_callback callback, void* context) {
-    return veltra_session_start(_session, callback, context);
-  });
+  return await(veltra_session_start);
 }
 
 std::optional<Answer> ClientSession::send(const Dictionary& message) {
   const VeltraValue value = toVeltraValue(Value(message));
-  return await([this, &value](veltra_callback callback, void* context) {
-    return veltra_session_send_dictionary(_session, value.get(), callback, context);
+  return await([&value](veltra_session* session, veltra_callback callback, void* context) {
+    return veltra_session_send_dictionary(session, value.get(), callback, context);
   });
 }
 
 std::optional<Answer> ClientSession::send(std::uint16_t category, std::uint16_t type,
                                           const std::optional<Dictionary>& payload, std::uint32_t flag) {
   const VeltraValue value = toVeltraValue(payload);
-  return await([&](veltra_callback callback, void* context) {
-    return veltra_session_send(_session, category, type, value.get(), flag, callback, context);
+  return await([&](veltra_session* session, veltra_callback callback, void* context) {
+    return veltra_session_send(session, category, type, value.get(), flag, callback, context);
   });
 }
 
@@ -126,49 +124,43 @@ std::optional<Answer> ClientSession::sendOneShot(const Identity& who, std::uint1
   const VeltraValue userInfo = toVeltraValue(who.userInfo);
   const veltra_session_options options = optionsOf(who, userInfo);
   const VeltraValue value = toVeltraValue(payload);
-  return await([&](veltra_callback callback, void* context) {
-    return veltra_session_send_one_shot(_session, &options, category, type, value.get(), callback, context);
+  return await([&](veltra_session* session, veltra_callback callback, void* context) {
+    return veltra_session_send_one_shot(session, &options, category, type, value.get(), callback, context);
   });
 }
 
 std::optional<Answer> ClientSession::flush() {
-  return await([this](veltra_callback callback, void* context) {
-    return veltra_session_flush(_session, callback, context);
-  });
+  return await(veltra_session_flush);
 }
 
 std::optional<Answer> ClientSession::states(const std::optional<Dictionary>& userInfo) {
   const VeltraValue value = toVeltraValue(userInfo);
-  return await([this, &value](veltra_callback callback, void* context) {
-    return veltra_session_states(_session, value.get(), callback, context);
+  return await([&value](veltra_session* session, veltra_callback callback, void* context) {
+    return veltra_session_states(session, value.get(), callback, context);
   });
 }
 
 std::optional<Answer> ClientSession::displayURL() {
-  return await([this](veltra_callback callback, void* context) {
-    return veltra_session_display_url(_session, callback, context);
-  });
+  return await(veltra_session_display_url);
 }
 
 std::optional<Answer> ClientSession::uploadFile(const std::string& path, const Progress& progress) {
   return await(
-      [this, &path](veltra_callback callback, void* context) {
-        return veltra_session_upload_file(_session, path.c_str(), callback, context);
+      [&path](veltra_session* session, veltra_callback callback, void* context) {
+        return veltra_session_upload_file(session, path.c_str(), callback, context);
       },
       progress);
 }
 
 std::optional<Answer> ClientSession::uploadLogData(const Array& data) {
   const VeltraValue value = toVeltraValue(Value(data));
-  return await([this, &value](veltra_callback callback, void* context) {
-    return veltra_session_upload_log_data(_session, value.get(), callback, context);
+  return await([&value](veltra_session* session, veltra_callback callback, void* context) {
+    return veltra_session_upload_log_data(session, value.get(), callback, context);
   });
 }
 
 std::optional<Answer> ClientSession::finish() {
-  return await([this](veltra_callback callback, void* context) {
-    return veltra_session_finish(_session, callback, context);
-  });
+  return await(veltra_session_finish);
 }
 
 std::uint64_t ClientSession::close() {
@@ -177,7 +169,7 @@ std::uint64_t ClientSession::close() {
 }
 
 std::optional<Answer> ClientSession::await(const Call& call, const Progress& progress) {
-  const veltra_status status = call(&ClientSession::answered, this);
+  const veltra_status status = call(_session, &ClientSession::answered, this);
   if (status != VELTRA_OK) return answerOfFailure(status);
   const auto begin = std::chrono::steady_clock::now();
   const auto interval = progress ? std::optional(kProgressInterval) : std::nullopt;

@@ -1,9 +1,8 @@
-// One session with the daemon, through the C interface. Own thread only.
+// A session with the daemon, through the C interface. Used by one thread.
 #pragma once
 
 #include <chrono>
 #include <functional>
-#include <memory>
 #include <optional>
 #include <string>
 
@@ -16,24 +15,23 @@
 
 namespace veltrad::ctl {
 
-// One call at a time, each waited for; copies come on the library's thread, in order among the answers. A
-// call that gives nothing was interrupted: then only close() makes sense. The interrupt must outlive it.
+// Makes one call at a time and waits for its answer. Copies come on the library's thread, in order with the
+// answers. A call that returns nothing was interrupted; then only close() may follow. The interrupt must
+// outlive it.
 class ClientSession {
  public:
   using CopyHandler = std::function<void(const AggregatedCopy&)>;
-  // With a handler the session aggregates.
+  // The session aggregates if there is a handler.
   explicit ClientSession(Interrupt& interrupt, CopyHandler aggregated = nullptr);
   ~ClientSession();
-  ClientSession(const ClientSession&) = delete;
-  ClientSession& operator=(const ClientSession&) = delete;
 
-  // Connects. Nothing: done; else a text that says what is wrong and what to do. No root: the environment's.
+  // Connects. Returns a text that says what is wrong, if anything is. Without a root uses the environment's.
   std::optional<std::string> open(const std::optional<std::string>& root, const Identity& identity);
-  // The same for a session that says nothing of itself: for sendOneShot().
+  // Like open(), for a session without session info, which only makes sendOneShot() calls.
   std::optional<std::string> openUndescribed(const std::optional<std::string>& root);
 
   std::optional<Answer> start();
-  // "category", "type", "payload" and "flag" as they are.
+  // `message` has "category", "type", "payload" and "flag".
   std::optional<Answer> send(const Dictionary& message);
   std::optional<Answer> send(std::uint16_t category, std::uint16_t type,
                              const std::optional<Dictionary>& payload, std::uint32_t flag);
@@ -42,32 +40,28 @@ class ClientSession {
   std::optional<Answer> flush();
   std::optional<Answer> states(const std::optional<Dictionary>& userInfo);
   std::optional<Answer> displayURL();
-  // While it is waited for, `progress` (when there is one) gets the time that has passed, twice a second, and
-  // nothing at the end.
+  // Called twice a second with the time that has passed, and at the end with nothing.
   using Progress = std::function<void(std::optional<std::chrono::seconds>)>;
   std::optional<Answer> uploadFile(const std::string& path, const Progress& progress = nullptr);
   std::optional<Answer> uploadLogData(const Array& data);
   std::optional<Answer> finish();
 
-  // Waits for at most 2 s. Returns how many calls were lost unwritten.
+  // Waits for at most 2 s. Returns how many calls were lost unsent.
   std::uint64_t close();
 
  private:
-  using Call = std::function<veltra_status(veltra_callback, void*)>;
+  using Call = std::function<veltra_status(veltra_session*, veltra_callback, void*)>;
   std::optional<std::string> create(veltra_session_options& options, const std::optional<std::string>& root);
   std::optional<Answer> await(const Call& call, const Progress& progress = nullptr);
-  // Both on the library's thread.
+  // Called on the library's thread.
   static void answered(void* context, const veltra_reply* reply);
   static void aggregated(void* context, const veltra_value* sessionInfo, double timestamp,
                          std::uint16_t category, std::uint16_t type, const veltra_value* payload);
 
-  // Constant after construction.
   Interrupt& _interrupt;
   const CopyHandler _aggregated;
-  const FileDescriptor _arrived;  // an event descriptor
-  // Own thread only.
+  const FileDescriptor _arrived;
   veltra_session* _session = nullptr;
-  // Guarded by _mutex.
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<Answer> _answer GUARDED_BY(_mutex);
 };

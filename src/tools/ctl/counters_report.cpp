@@ -1,11 +1,10 @@
-// The daemon's counters for a person. Pure functions; any thread.
+// Formats the daemon's counters.
 #include "tools/ctl/counters_report.h"
 
 #include <fmt/chrono.h>
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <cmath>
 #include <ctime>
 
 #include "base/text.h"
@@ -15,7 +14,7 @@ namespace veltrad::ctl {
 namespace {
 
 std::string formatTime(double secondsSince1970) {
-  // Times beyond what a calendar of four digits can say are shown as they are.
+  // Years with more than four digits are not formatted.
   if (!(secondsSince1970 >= 0 && secondsSince1970 < 253402300800.0))
     return fmt::format("{}", secondsSince1970);
   const auto seconds = static_cast<std::time_t>(secondsSince1970);

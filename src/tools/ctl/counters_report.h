@@ -1,4 +1,4 @@
-// The daemon's counters for a person. Pure functions; any thread.
+// The daemon's counters in readable form.
 #pragma once
 
 #include <cstdint>
@@ -9,16 +9,16 @@
 
 namespace veltrad::ctl {
 
-// What run/veltrad/counters.json holds: {"pid": n, "started": seconds since 1970, "counts": {reason: n}}.
+// The content of run/veltrad/counters.json: {"pid": n, "started": seconds since 1970, "counts": {reason: n}}.
 struct CountersReport {
   std::int64_t pid = 0;
   double started = 0;
   Dictionary counts;
 };
 
-// Nothing when the text is no such file.
+// Nothing if the text is not such a file.
 std::optional<CountersReport> readCounters(std::string_view json);
-// A heading, then one line for each reason, in order of the reasons. No line break at the end.
+// A heading, then one line per reason, in order of the reasons. No line break at the end.
 std::string formatCounters(const CountersReport& report);
 
 }  // namespace veltrad::ctl

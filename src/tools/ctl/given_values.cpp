@@ -1,4 +1,4 @@
-// Values that a user gives as JSON, and what is said of them. Pure functions; any thread.
+// Checks values that a user gives as JSON.
 #include "tools/ctl/given_values.h"
 
 #include <fmt/format.h>
@@ -8,28 +8,18 @@
 #include "formats/json.h"
 
 namespace veltrad::ctl {
+namespace {
+
+// In the order of Value::Type.
+constexpr const char* kTypeNames[] = {"a boolean", "an integer", "an integer", "a number with a fraction",
+                                      "a text",    "a date",     "data",       "an array",
+                                      "an object"};
+static_assert(std::size(kTypeNames) == static_cast<std::size_t>(Value::Type::dictionary) + 1);
+
+}  // namespace
 
 const char* typeName(const Value& value) {
-  switch (value.type()) {
-    case Value::Type::boolean:
-      return "a boolean";
-    case Value::Type::signedInteger:
-    case Value::Type::unsignedInteger:
-      return "an integer";
-    case Value::Type::real:
-      return "a number with a fraction";
-    case Value::Type::string:
-      return "a text";
-    case Value::Type::date:
-      return "a date";
-    case Value::Type::data:
-      return "data";
-    case Value::Type::array:
-      return "an array";
-    case Value::Type::dictionary:
-      return "an object";
-  }
-  return "something else";
+  return kTypeNames[static_cast<std::size_t>(value.type())];
 }
 
 bool hasUnsendableKey(const Value& value) {

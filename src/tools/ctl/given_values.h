@@ -1,4 +1,4 @@
-// Values that a user gives as JSON, and what is said of them. Pure functions; any thread.
+// Values that a user gives as JSON.
 #pragma once
 
 #include <string>
@@ -9,11 +9,11 @@
 
 namespace veltrad::ctl {
 
-// "an integer", "an object".
+// For example "an integer" or "an object".
 const char* typeName(const Value& value);
-// The C interface takes keys that end at their first NUL.
+// Whether a key contains NUL, which the C interface cannot pass.
 bool hasUnsendableKey(const Value& value);
-// An array of log data. The failure says in one line what is wrong and what was expected.
+// Reads an array of log data. The error is one line that says what is wrong and what was expected.
 Result<Array, std::string> parseLogData(std::string_view text);
 
 }  // namespace veltrad::ctl

@@ -1,5 +1,4 @@
-// Waits that the user can end. Own thread only; every other thread must have the signals blocked, as the
-// library's do.
+// Waits for a descriptor and for signals.
 #include "tools/ctl/interrupt.h"
 
 #include <poll.h>

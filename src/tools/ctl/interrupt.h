@@ -1,5 +1,5 @@
-// Waits that the user can end. Own thread only; every other thread must have the signals blocked, as the
-// library's do.
+// Waits that the user can interrupt. Used by one thread; all others must block the signals, as the library's
+// do.
 #pragma once
 
 #include <chrono>
@@ -9,15 +9,16 @@
 
 namespace veltrad::ctl {
 
-// Until begin(), SIGINT and SIGTERM end the process as ever. From then on the first one ends a wait, and
-// after it both end the process again.
+// Before begin(), SIGINT and SIGTERM end the process. After begin(), the first signal ends the wait, and
+// further ones end the process.
 class Interrupt {
  public:
   void begin();
 
   enum class Wake { ready, timeout, interrupted };
-  // Until `descriptor` can be read (or has ended or failed), the time is over, or a signal has come. No time:
-  // for ever. A descriptor of -1 is never ready. Once interrupted it says so always.
+  // Waits until `descriptor` can be read (or has ended or failed), the time has passed, or a signal arrives.
+  // Without a time waits forever. A descriptor of -1 is never ready. After an interruption always returns
+  // `interrupted`.
   Wake wait(int descriptor, std::optional<std::chrono::milliseconds> time = std::nullopt);
 
  private:

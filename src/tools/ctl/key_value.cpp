@@ -1,4 +1,4 @@
-// KEY=VALUE of the command line. Pure functions; any thread.
+// Parses KEY=VALUE.
 #include "tools/ctl/key_value.h"
 
 #include <fmt/format.h>

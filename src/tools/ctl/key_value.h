@@ -1,4 +1,4 @@
-// KEY=VALUE of the command line. Pure functions; any thread.
+// Parses KEY=VALUE arguments.
 #pragma once
 
 #include <string>
@@ -10,10 +10,10 @@
 
 namespace veltrad::ctl {
 
-// Values that read as JSON numbers are numbers ("12", "-0.5"; "007" is none), true and false are booleans,
-// everything else is a text. The failure says in one line what was expected.
+// JSON numbers ("12", "-0.5", but not "007") become numbers, true and false booleans, everything else a text.
+// The error is one line that says what was expected.
 Result<Dictionary::Entry, std::string> parseKeyValue(std::string_view text);
-// Of equal keys the last one counts.
+// If a key is repeated, the last value counts.
 Result<Dictionary, std::string> parseKeyValues(const std::vector<std::string>& texts);
 
 }  // namespace veltrad::ctl

@@ -1,4 +1,4 @@
-// Lines from a descriptor, of bounded length. Own thread only.
+// Reads lines from a descriptor.
 #include "tools/ctl/line_reader.h"
 
 #include <unistd.h>

@@ -1,4 +1,4 @@
-// Lines from a descriptor, of bounded length. Own thread only.
+// Reads lines of bounded length from a descriptor.
 #pragma once
 
 #include <cstdint>
@@ -8,35 +8,35 @@
 
 namespace veltrad::ctl {
 
-// The descriptor and the interrupt must outlive it. A line arrives as soon as its line break has; the last
-// one may lack it. Of a line longer than `longest` bytes nothing is kept.
+// The descriptor and the interrupt must outlive it. The last line may lack its line break. Lines longer than
+// `longest` bytes are skipped and reported.
 class LineReader {
  public:
   LineReader(int descriptor, std::size_t longest, Interrupt& interrupt)
       : _descriptor(descriptor), _longest(longest), _interrupt(interrupt) {}
 
   enum class Got { line, tooLong, end, interrupted, failed };
-  // Without its line break, in line(). After `failed` errno says why.
+  // Reads a line, which is then in line() without its line break. After `failed`, errno says why.
   Got next();
   const std::string& line() const { return _line; }
-  // Of the last line that next() gave, from 1.
+  // The number of the last line, starting at 1.
   std::uint64_t number() const { return _number; }
 
  private:
-  // Takes what the buffer holds of the line; true when its line break was among it.
+  // Moves a part of the line from the buffer. True if that completes the line.
   bool takeFromBuffer();
   Got finishLine();
 
-  // Constant after construction.
   const int _descriptor;
   const std::size_t _longest;
   Interrupt& _interrupt;
-  // Own thread only.
   std::string _buffer;
-  std::size_t _at = 0;  // start of what is not taken yet
+  // The start of the unread part of the buffer.
+  std::size_t _at = 0;
   std::string _line;
   bool _tooLong = false;
-  bool _begun = false;  // some bytes of the line have come
+  // A part of the line has been read.
+  bool _begun = false;
   std::uint64_t _number = 0;
 };
 

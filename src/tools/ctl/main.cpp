@@ -1,10 +1,11 @@
-// veltractl: talks to veltrad through libveltra, as any client does. The main thread.
+// veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
 
 #include "tools/ctl/options.h"
 #include "tools/ctl/send_command.h"
 #include "tools/ctl/session_command.h"
 #include "tools/ctl/stats_command.h"
+#include "tools/ctl/status_command.h"
 
 int main(int argc, char** argv) {
   using namespace veltrad::ctl;
@@ -15,8 +16,17 @@ int main(int argc, char** argv) {
     return ending->status;
   }
   const Options& options = std::get<Options>(parsed);
-  if (options.command == Command::stats) return runStats(options);
   Interrupt interrupt;
-  return options.command == Command::session ? runSession(options, interrupt)
-                                             : runOneCall(options, interrupt);
+  switch (options.command) {
+    case Command::stats:
+      return runStats(options);
+    case Command::status:
+      return runStatus(options, interrupt);
+    case Command::metrics:
+      return runMetrics(options);
+    case Command::session:
+      return runSession(options, interrupt);
+    default:
+      return runOneCall(options, interrupt);
+  }
 }

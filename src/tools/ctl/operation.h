@@ -1,5 +1,8 @@
-// The operations of a session as its lines and answers name them. Constants; any thread.
+// The operations of a session, and their names in lines and answers.
 #pragma once
+
+#include <cstddef>
+#include <iterator>
 
 namespace veltrad::ctl {
 
@@ -17,33 +20,14 @@ enum class Operation {
   finish
 };
 
+inline constexpr const char* kOperationNames[] = {"start",   "send",       "oneShot",    "flush",
+                                                  "states",  "displayURL", "uploadFile", "uploadLogData",
+                                                  "restart", "sleep",      "finish"};
+static_assert(std::size(kOperationNames) == static_cast<std::size_t>(Operation::finish) + 1);
+
 // The "op" of a line and of its answer.
 constexpr const char* operationName(Operation operation) {
-  switch (operation) {
-    case Operation::start:
-      return "start";
-    case Operation::send:
-      return "send";
-    case Operation::oneShot:
-      return "oneShot";
-    case Operation::flush:
-      return "flush";
-    case Operation::states:
-      return "states";
-    case Operation::displayURL:
-      return "displayURL";
-    case Operation::uploadFile:
-      return "uploadFile";
-    case Operation::uploadLogData:
-      return "uploadLogData";
-    case Operation::restart:
-      return "restart";
-    case Operation::sleep:
-      return "sleep";
-    case Operation::finish:
-      return "finish";
-  }
-  return "";
+  return kOperationNames[static_cast<std::size_t>(operation)];
 }
 
 }  // namespace veltrad::ctl

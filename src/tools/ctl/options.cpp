@@ -1,4 +1,4 @@
-// The command line of veltractl, and the one file that sees CLI11: its exceptions end here. Any thread.
+// Parses the command line. Only this file uses CLI11, and it catches its exceptions.
 #include "tools/ctl/options.h"
 
 #include <fmt/format.h>
@@ -19,9 +19,10 @@ namespace {
 
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
-    "expected session, send, one-shot, states, display-url, upload, upload-log-data or stats";
+    "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status or "
+    "metrics";
 
-// As they stand on the command line, before they are put together.
+// Arguments in text form.
 struct Texts {
   std::optional<std::string> client;
   std::optional<std::string> service;
@@ -38,17 +39,16 @@ std::string textProblem(const std::string& text) {
   return isUTF8(text) ? std::string() : fmt::format("\"{}\": expected UTF-8", escapedForLog(text));
 }
 
-// Decimal, from 0 to `most`.
+// A decimal number in the range of T.
 template <typename T, typename Target>
-CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, T most,
-                       const std::string& help) {
-  const T least = std::numeric_limits<T>::min();
-  const auto read = [name, &target, least, most](const std::string& text) {
+CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, const std::string& help) {
+  const auto read = [name, &target](const std::string& text) {
     T number = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (error != std::errc() || end != text.data() + text.size() || number > most) {
-      throw CLI::ValidationError(name, fmt::format("expected an integer from {} to {}, found \"{}\"", least,
-                                                   most, escapedForLog(text)));
+    if (error != std::errc() || end != text.data() + text.size()) {
+      throw CLI::ValidationError(
+          name, fmt::format("expected an integer from {} to {}, found \"{}\"", std::numeric_limits<T>::min(),
+                            std::numeric_limits<T>::max(), escapedForLog(text)));
     }
     target = number;
   };
@@ -63,17 +63,16 @@ void addText(CLI::App& app, const std::string& name, std::optional<std::string>&
       ->group("Identity");
 }
 
-// `oneEach`: the words after the option belong to the command itself.
+// `oneEach`: the option takes one value, because further arguments belong to the command.
 void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) {
   const char* group = "Identity";
-  addNumber<std::int32_t>(app, "--client-type", identity.clientType, std::numeric_limits<std::int32_t>::max(),
+  addNumber<std::int32_t>(app, "--client-type", identity.clientType,
                           "Kind of client, which selects the storebag; 0 to 17 are defined")
       ->group(group);
-  addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, std::numeric_limits<std::uint32_t>::max(),
-                           "The client's number for this session")
+  addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, "The client's number for this session")
       ->group(group);
   addNumber<std::uint16_t>(app, "--client-version", identity.clientVersion,
-                           std::numeric_limits<std::uint16_t>::max(), "The client's version, 0 to 65535")
+                           "The client's version, 0 to 65535")
       ->group(group);
   addText(app, "--client", texts.client, "User info \"clientName\"");
   addText(app, "--service", texts.service, "User info \"serviceName\"");
@@ -110,7 +109,7 @@ With --aggregate, copies are printed between the answers, one per line, with nul
 Example:
   echo '{"op":"flush"}' | veltractl session --client-type 7 --client phone --service ringer)";
 
-// Calls a positional argument by its form and subcommands by their usual name.
+// Shows the form of positional arguments, and calls subcommands commands.
 class Help : public CLI::Formatter {
  public:
   Help() {
@@ -141,10 +140,9 @@ void addSession(CLI::App& app, Options& options, Texts& texts) {
 }
 
 void addMessage(CLI::App& app, Options& options, Texts& texts) {
-  addNumber<std::uint16_t>(app, "--category", options.category, 65535,
-                           "What the message is about, 0 to 65535")
+  addNumber<std::uint16_t>(app, "--category", options.category, "What the message is about, 0 to 65535")
       ->required();
-  addNumber<std::uint16_t>(app, "--type", options.type, 65535, "Which message of the category, 0 to 65535")
+  addNumber<std::uint16_t>(app, "--type", options.type, "Which message of the category, 0 to 65535")
       ->required();
   app.add_option("payload", texts.payload,
                  "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
@@ -158,7 +156,7 @@ void addSend(CLI::App& app, Options& options, Texts& texts) {
   CLI::App* send =
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
   addMessage(*send, options, texts);
-  addNumber<std::uint32_t>(*send, "--flag", options.flag, std::numeric_limits<std::uint32_t>::max(),
+  addNumber<std::uint32_t>(*send, "--flag", options.flag,
                            "1: post at once, 2: regardless of sampling, 3: both, 0: neither");
   send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
@@ -183,10 +181,23 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
                              "Show the address at which a session's reports can be viewed");
   addIdentity(*url, options.identity, texts, false);
   url->footer("Example:\n  veltractl display-url --client-type 7");
+}
 
+// For those who look after a device.
+void addObservation(CLI::App& app, Options& options) {
+  const char* group = "Looking after a device";
+  CLI::App* status = addCommand(app, options, Command::status, "status",
+                                "Show the running daemon, its sessions, storebags and servers")
+                         ->group(group);
+  status->add_flag("--watch", options.watch, "Show it anew every second, until interrupted");
+  status->footer("Examples:\n  veltractl status --watch\n  veltractl status --json");
+  addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text")
+      ->group(group)
+      ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
-                               "Show what happened to messages, by reason, with counts");
-  stats->footer("Examples:\n  veltractl stats\n  veltractl --json stats");
+                               "Show what happened to messages, by reason, with counts")
+                        ->group(group);
+  stats->footer("Examples:\n  veltractl stats\n  veltractl stats --json");
 }
 
 void addUploads(CLI::App& app, Options& options, Texts& texts) {
@@ -216,7 +227,7 @@ void addGlobals(CLI::App& app, Options& options) {
       ->check(CLI::Validator(
           [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
           ""));
-  app.add_flag("--json", options.json, "Print stats as JSON; the other commands always print JSON");
+  app.add_flag("--json", options.json, "Print status and stats as JSON; what opens a session always does");
   app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
   app.set_help_flag("-h,--help", "Print this help");
   app.require_subcommand(1);
@@ -228,7 +239,7 @@ void addGlobals(CLI::App& app, Options& options) {
       "Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
 
-// What CLI11 says, in better words where it says little.
+// Replaces messages of CLI11 that say too little.
 std::string problemOf(const CLI::App& app, const CLI::ParseError& error) {
   const std::vector<std::string> left = app.remaining(true);
   const bool noCommand = app.get_subcommands().empty();
@@ -241,7 +252,7 @@ std::string problemOf(const CLI::App& app, const CLI::ParseError& error) {
                      kExpectedCommands);
 }
 
-// Help and version are thrown, too.
+// CLI11 also throws for help and version.
 Ending endingOf(const CLI::App& app, const CLI::ParseError& error) {
   if (error.get_exit_code() != 0) {
     return Ending{kWrongUsage, "",
@@ -252,7 +263,7 @@ Ending endingOf(const CLI::App& app, const CLI::ParseError& error) {
   return Ending{0, output.str(), ""};
 }
 
-// The texts have passed their checks.
+// The texts have been checked.
 void putTogether(const Texts& texts, Options& options) {
   if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
   if (!texts.client && !texts.service && texts.userInfo.empty()) return;
@@ -275,6 +286,7 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   addOneShot(app, options, texts);
   addQuestions(app, options, texts);
   addUploads(app, options, texts);
+  addObservation(app, options);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {

@@ -1,4 +1,4 @@
-// The command line of veltractl. Pure; any thread.
+// The command line of veltractl.
 #pragma once
 
 #include <cstdint>
@@ -10,36 +10,50 @@
 
 namespace veltrad::ctl {
 
-// What a session says of itself; what is absent is left out of its session info.
+// The content of the session info. Absent values are left out.
 struct Identity {
-  std::optional<std::int32_t> clientType;  // 0 to 17 are defined; the daemon takes any
+  std::optional<std::int32_t> clientType;
   std::optional<std::uint32_t> sessionID;
   std::optional<std::uint16_t> clientVersion;
   bool requireUserInfo = false;
   bool batchEvents = false;
-  // With "clientName" and "serviceName" among the rest. Absent without --client, --service and --user-info.
+  // From --client, --service and --user-info.
   std::optional<Dictionary> userInfo;
 };
 
-enum class Command { session, send, oneShot, states, displayURL, upload, uploadLogData, stats };
-
-struct Options {
-  Command command = Command::session;
-  std::optional<std::string> root;  // absent: VELTRA_ROOT, else "/"
-  bool json = false;
-  Identity identity;                  // all but stats
-  bool aggregate = false;             // session
-  std::optional<std::string> input;   // session: a file; absent: standard input
-  std::uint16_t category = 0;         // send, oneShot
-  std::uint16_t type = 0;             // likewise
-  std::uint32_t flag = 0;             // send
-  std::optional<Dictionary> payload;  // send, oneShot; absent without KEY=VALUE
-  std::string file;                   // upload, uploadLogData
+enum class Command {
+  session,
+  send,
+  oneShot,
+  states,
+  displayURL,
+  upload,
+  uploadLogData,
+  stats,
+  status,
+  metrics
 };
 
-// What to print instead of running: help, version, or what is wrong with the command line.
+// The command's options and arguments, by name.
+struct Options {
+  Command command = Command::session;
+  std::optional<std::string> root;
+  bool json = false;
+  Identity identity;
+  bool aggregate = false;
+  std::optional<std::string> input;
+  std::uint16_t category = 0;
+  std::uint16_t type = 0;
+  std::uint32_t flag = 0;
+  std::optional<Dictionary> payload;
+  std::string file;
+  bool watch = false;
+};
+
+// What to print instead of running: help, version, or what is wrong with the command line. The status is 2
+// for wrong usage.
 struct Ending {
-  int status = 0;  // 0, or 2 for wrong usage
+  int status = 0;
   std::string output;
   std::string errorOutput;
 };

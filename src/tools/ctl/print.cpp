@@ -1,5 +1,4 @@
-// What veltractl writes: results on standard output, everything else on standard error. Any
-// thread.
+// Writes whole lines.
 #include "tools/ctl/print.h"
 
 #include <fmt/format.h>
@@ -12,7 +11,8 @@
 namespace veltrad::ctl {
 
 bool printLine(std::string_view line) {
-  const std::string whole = std::string(line) + '\n';  // one call, which takes the stream's lock once
+  // One call, so that lines of several threads do not mix.
+  const std::string whole = std::string(line) + '\n';
   std::fwrite(whole.data(), 1, whole.size(), stdout);
   if (std::fflush(stdout) == 0 && !std::ferror(stdout)) return true;
   complain(fmt::format("Cannot write to standard output: {}.", std::strerror(errno)));

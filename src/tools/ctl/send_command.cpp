@@ -1,5 +1,4 @@
-// `veltractl send`, `one-shot`, `states`, `display-url`, `upload` and `upload-log-data`: one call on a
-// connection of its own. The main thread.
+// Makes one call and prints its answer.
 #include "tools/ctl/send_command.h"
 
 #include <fmt/format.h>
@@ -15,7 +14,7 @@
 namespace veltrad::ctl {
 namespace {
 
-// Twice what the largest call has: JSON is the longer form.
+// Twice the size of the largest call, because the JSON form is longer.
 constexpr std::size_t kLargestFile = 128u << 20;
 
 Result<Array, std::string> readLogData(const std::string& path) {
@@ -28,7 +27,8 @@ Result<Array, std::string> readLogData(const std::string& path) {
 
 struct Called {
   Operation operation;
-  std::optional<Answer> answer;  // nothing: the user has interrupted it
+  // Nothing after an interruption.
+  std::optional<Answer> answer;
 };
 
 Called call(ClientSession& session, const Options& options, const Array& logData) {
@@ -46,14 +46,14 @@ Called call(ClientSession& session, const Options& options, const Array& logData
       return {Operation::uploadFile, session.uploadFile(options.file, uploadProgress(options.file))};
     case Command::uploadLogData:
       return {Operation::uploadLogData, session.uploadLogData(logData)};
-    case Command::session:
-    case Command::stats:
+    default:
       break;
   }
-  std::abort();  // these are no single calls
+  // These commands are handled elsewhere.
+  std::abort();
 }
 
-// Says why there is no answer.
+// Prints why there is no answer.
 int failed(const std::optional<Answer>& answer) {
   complain(answer ? answer->error->description : "Interrupted.");
   return 1;

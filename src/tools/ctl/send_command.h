@@ -1,5 +1,5 @@
-// `veltractl send`, `one-shot`, `states`, `display-url`, `upload` and `upload-log-data`: one call on a
-// connection of its own. The main thread.
+// `veltractl send`, `one-shot`, `states`, `display-url`, `upload` and `upload-log-data`: one call on its own
+// connection.
 #pragma once
 
 #include "tools/ctl/interrupt.h"
@@ -7,8 +7,8 @@
 
 namespace veltrad::ctl {
 
-// Prints the answer as one line of JSON. The exit status: 0, 1 when there was no answer or nobody took the
-// file or the log data, 2 when the latter's file cannot be read.
+// Prints the answer as one line of JSON. Returns the exit status: 0; 1 if there was no answer, or no server
+// took the file or the log data; 2 if the file with the log data cannot be read.
 int runOneCall(const Options& options, Interrupt& interrupt);
 
 }  // namespace veltrad::ctl

@@ -1,4 +1,4 @@
-// `veltractl session`. The main thread.
+// Runs the lines of a session.
 #include "tools/ctl/session_command.h"
 
 #include <fcntl.h>
@@ -16,7 +16,7 @@
 namespace veltrad::ctl {
 namespace {
 
-// What follows a line: the next one, or the end with this exit status.
+// The exit status, or nothing if the next line follows.
 using Ended = std::optional<int>;
 
 class SessionRun {
@@ -51,7 +51,7 @@ class SessionRun {
     return print(formatMalformedLine(number, description));
   }
 
-  // The exit status when nothing else speaks against 0.
+  // The exit status at the end of the input.
   int end() const {
     if (_unanswered == 0) return 0;
     complain(fmt::format("Calls that ended without an answer: {}.", _unanswered));
@@ -59,7 +59,7 @@ class SessionRun {
   }
 
  private:
-  // Nothing when the user interrupts.
+  // Nothing after an interruption.
   std::optional<Answer> answerTo(const SessionLine& line) {
     switch (line.operation) {
       case Operation::start:
@@ -68,7 +68,7 @@ class SessionRun {
       case Operation::send:
         return _session.send(line.message);
       case Operation::oneShot:
-        break;  // no line asks for it
+        break;
       case Operation::flush:
         return _session.flush();
       case Operation::states:
@@ -128,7 +128,7 @@ int runSession(const Options& options, Interrupt& interrupt) {
       return 2;
     }
   }
-  // A copy that cannot be written has been complained about; the next answer then ends the session.
+  // If a copy cannot be printed, printing the next answer fails too, which ends the session.
   const auto printCopy = [](const AggregatedCopy& copy) {
     static_cast<void>(printLine(formatAggregated(copy)));
   };

@@ -1,4 +1,4 @@
-// `veltractl session`. The main thread.
+// `veltractl session`.
 #pragma once
 
 #include "tools/ctl/interrupt.h"
@@ -6,9 +6,9 @@
 
 namespace veltrad::ctl {
 
-// Starts a session, then runs one line after the other. The exit status: 0 at the end of the input or when
-// the user interrupts, 1 when the daemon refuses, a call ends without an answer or the connection ends, 2
-// when the input cannot be read.
+// Starts a session, then runs the input lines. Returns the exit status: 0 at the end of the input or after an
+// interruption; 1 if the daemon refuses, a call ends without an answer, or the connection ends; 2 if the
+// input cannot be read.
 int runSession(const Options& options, Interrupt& interrupt);
 
 }  // namespace veltrad::ctl

@@ -1,7 +1,9 @@
-// Reads one line of `veltractl session`. Pure functions; any thread.
+// Parses the input lines.
 #include "tools/ctl/session_lines.h"
 
 #include <fmt/format.h>
+
+#include <algorithm>
 
 #include "formats/json.h"
 #include "tools/ctl/given_values.h"
@@ -10,13 +12,10 @@
 namespace veltrad::ctl {
 namespace {
 
-constexpr Operation kOperations[] = {Operation::send,       Operation::flush,      Operation::states,
-                                     Operation::displayURL, Operation::uploadFile, Operation::uploadLogData,
-                                     Operation::restart,    Operation::sleep,      Operation::finish};
 constexpr const char* kExpectedOperations =
     "expected one of send, flush, states, displayURL, uploadFile, uploadLogData, restart, sleep, finish";
 
-// What is wrong with the field; nothing when it is absent or an object.
+// Says what is wrong with the field, unless it is absent or an object.
 std::optional<std::string> objectProblem(Operation operation, const Dictionary& line, const char* key) {
   const Value* value = line.find(key);
   if (!value || value->asDictionary()) return std::nullopt;
@@ -96,9 +95,10 @@ Result<Operation, std::string> operationOf(const Dictionary& line) {
   if (!op) return Failure{fmt::format("no \"op\": {}", kExpectedOperations)};
   const std::string* name = op->asString();
   if (!name) return Failure{fmt::format("\"op\": expected a text, found {}", typeName(*op))};
-  for (Operation operation : kOperations) {
-    if (*name == operationName(operation)) return operation;
-  }
+  const auto* found = std::find(std::begin(kOperationNames), std::end(kOperationNames), *name);
+  const auto operation = static_cast<Operation>(found - std::begin(kOperationNames));
+  const bool known = found != std::end(kOperationNames);
+  if (known && operation != Operation::start && operation != Operation::oneShot) return operation;
   return Failure{fmt::format("unknown op {}: {}", formats::writeJSON(*op), kExpectedOperations)};
 }
 

@@ -1,4 +1,4 @@
-// Reads one line of `veltractl session`. Pure functions; any thread.
+// Parses the input lines of `veltractl session`.
 #pragma once
 
 #include <chrono>
@@ -12,26 +12,26 @@
 
 namespace veltrad::ctl {
 
-// Bytes of a line without its line break, as many as the largest call has; a longer one is malformed.
+// The largest number of bytes of a line without its line break; the same as for a call.
 inline constexpr std::size_t kLongestLine = 64u << 20;
 inline constexpr std::chrono::milliseconds kLongestSleep = std::chrono::hours(1);
 
+// An operation and its arguments. The message of a send is the line without "op".
 struct SessionLine {
-  Operation operation = Operation::flush;  // never start
-  Dictionary message;                      // send: the line without "op"
-  std::optional<Dictionary> userInfo;      // states
-  std::string path;                        // uploadFile
-  Array data;                              // uploadLogData
-  std::chrono::milliseconds duration{0};   // sleep
+  Operation operation = Operation::flush;
+  Dictionary message;
+  std::optional<Dictionary> userInfo;
+  std::string path;
+  Array data;
+  std::chrono::milliseconds duration{0};
 };
 
-// Nothing but blanks: the session skips it.
+// Blank lines are skipped.
 bool isBlankLine(std::string_view line);
 
-// A JSON object such as {"op":"send","category":5,"type":1,"payload":{"codec":"opus"},"flag":0}. "category"
-// and "type" of a send are the daemon's to judge and stay as they are; every other field must have its type.
-// Fields that no operation knows are ignored. The failure says in one line what is wrong and what was
-// expected.
+// Parses a JSON object such as {"op":"send","category":5,"type":1,"payload":{"codec":"opus"},"flag":0}. The
+// daemon checks "category" and "type" of a send; other fields must have the right type. Unknown fields are
+// ignored. The error is one line that says what is wrong and what was expected.
 Result<SessionLine, std::string> parseSessionLine(std::string_view line);
 
 }  // namespace veltrad::ctl

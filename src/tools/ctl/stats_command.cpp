@@ -1,4 +1,4 @@
-// `veltractl stats`. The main thread.
+// Reads and prints the daemon's counters.
 #include "tools/ctl/stats_command.h"
 
 #include <fmt/format.h>

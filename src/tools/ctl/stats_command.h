@@ -1,12 +1,12 @@
-// `veltractl stats`. The main thread.
+// `veltractl stats`.
 #pragma once
 
 #include "tools/ctl/options.h"
 
 namespace veltrad::ctl {
 
-// Prints the daemon's counters: a table, or the file as it is with --json. The exit status: 0, or 1 when
-// there is no daemon; the counts that the last one left are printed all the same.
+// Prints the daemon's counters as a table, or the file itself with --json. Returns the exit status: 0, or 1
+// if no daemon runs; then the counts of its last run are printed.
 int runStats(const Options& options);
 
 }  // namespace veltrad::ctl

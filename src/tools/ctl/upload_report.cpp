@@ -1,4 +1,4 @@
-// The file's fate in words. The main thread.
+// Reports the progress and the result of an upload.
 #include "tools/ctl/upload_report.h"
 
 #include <fmt/format.h>
@@ -13,7 +13,7 @@ namespace veltrad::ctl {
 
 namespace {
 
-// To the line's start, and nothing behind it.
+// Moves to the start of the line and clears it.
 constexpr const char* kFreshLine = "\r\x1b[K";
 
 std::string fate(const std::string& file, const Answer& answer) {

@@ -1,4 +1,4 @@
-// What `veltractl upload` says on standard error while a file is uploaded and afterwards. The main thread.
+// What `veltractl upload` prints on standard error.
 #pragma once
 
 #include <string>
@@ -8,9 +8,9 @@
 
 namespace veltrad::ctl {
 
-// On a terminal one line that counts the seconds; elsewhere nothing.
+// On a terminal prints a line that counts the seconds.
 ClientSession::Progress uploadProgress(const std::string& path);
-// What became of the file, by an answer whose status is VELTRA_OK. True: it was uploaded.
+// Prints the result, for an answer with the status VELTRA_OK. Returns whether the file was uploaded.
 bool reportUpload(const std::string& path, const Answer& answer);
 
 }  // namespace veltrad::ctl

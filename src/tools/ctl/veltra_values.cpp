@@ -1,4 +1,4 @@
-// Between the system's values and those of the C interface. Pure; any thread.
+// Converts values.
 #include "tools/ctl/veltra_values.h"
 
 namespace veltrad::ctl {

@@ -1,4 +1,4 @@
-// Between the system's values and those of the C interface. Pure; any thread.
+// Converts between values and the values of the C interface.
 #pragma once
 
 #include <memory>
@@ -14,11 +14,10 @@ struct VeltraValueRelease {
 };
 using VeltraValue = std::unique_ptr<veltra_value, VeltraValueRelease>;
 
-// Keys end at their first NUL: the caller has refused those that hold one.
+// Keys must not contain NUL.
 VeltraValue toVeltraValue(const Value& value);
-// Null for nothing.
 VeltraValue toVeltraValue(const std::optional<Dictionary>& dictionary);
-// Nothing for NULL and for anything else than a dictionary.
+// Nothing if it is not a dictionary.
 std::optional<Dictionary> dictionaryOf(const veltra_value* value);
 
 }  // namespace veltrad::ctl

@@ -1,4 +1,4 @@
-// What the lab answers before it misbehaves, and how a rule changes that. Pure functions; any thread.
+// Makes the lab's answers and applies rules to them.
 #include "answers.h"
 
 #include <ctime>

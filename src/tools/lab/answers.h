@@ -1,4 +1,4 @@
-// What the lab answers before it misbehaves, and how a rule changes that. Pure functions; any thread.
+// The lab's answers, and how rules change them.
 #pragma once
 
 #include <cstdint>
@@ -14,19 +14,20 @@ struct Answer {
   int status = 200;
   std::string type = "application/json";
   std::string body;
-  Dictionary headers;  // texts
+  // Values are texts.
+  Dictionary headers;
 };
 
-// RFC 9110's date format.
+// In the format of RFC 9110.
 std::string httpDate(std::int64_t secondsSince1970);
 
-// The signed container, or 304 with nothing when the file is not newer than `ifModifiedSince` (empty: not
-// asked).
+// The signed container, or 304 without a body if the file is not newer than `ifModifiedSince` (which may be
+// empty).
 Answer answerWithStorebag(const StorebagFile& file, const config::SigningKey& key, Rule::Signature sign,
                           int maxAge, const std::string& ifModifiedSince);
 // 404 or 500, with the reason as text.
 Answer answerWithFailure(const StorebagFailure& failure);
-// Status, body and headers as the rule says.
+// Changes status, body and headers as the rule says.
 void applyRule(const Rule& rule, Answer& answer);
 
 }  // namespace veltrad::lab

@@ -1,4 +1,4 @@
-// Everything that arrives at the lab, kind by kind. Any thread.
+// What arrives at the lab, by kind. Any thread.
 #pragma once
 
 #include <array>
@@ -9,7 +9,7 @@
 
 namespace veltrad::lab {
 
-// One file each under received/.
+// Each kind has a file under received/.
 struct Arrivals {
   explicit Arrivals(const Directory& directory)
       : events(directory.receivedPath("events")),
@@ -23,7 +23,6 @@ struct Arrivals {
     const char* title;
     Received& lines;
   };
-  // As the live page shows them.
   std::array<Kind, 5> kinds() {
     return {{{"events", "Events", events},
              {"dashboard", "Dashboard datagrams", dashboard},

@@ -1,4 +1,4 @@
-// The lab's own TLS certificate: made with OpenSSL, written with the platform's file store.
+// Makes the certificate with OpenSSL.
 #include "certificate.h"
 
 #include <openssl/bio.h>

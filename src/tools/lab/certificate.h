@@ -1,4 +1,4 @@
-// The lab's own TLS certificate. Called once, at start, by the main thread.
+// The lab's own TLS certificate.
 #pragma once
 
 #include <optional>
@@ -6,8 +6,8 @@
 
 namespace veltrad::lab {
 
-// Writes a new P-256 key (mode 0600) and a certificate that it signed itself, for localhost, 127.0.0.1 and
-// ::1, good for ten years, both as PEM. Nothing: done; else one line that says what failed.
+// Writes a new P-256 key (mode 0600) and a self-signed certificate for localhost, 127.0.0.1 and ::1, valid
+// for ten years, both as PEM. Returns one line that says what failed, if anything did.
 std::optional<std::string> makeCertificate(const std::string& certificatePath, const std::string& keyPath);
 
 }  // namespace veltrad::lab

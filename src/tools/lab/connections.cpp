@@ -1,4 +1,4 @@
-// The open TLS connections, and how to end one of them or all. Any thread.
+// Finds the open TLS connections with callbacks of OpenSSL.
 #include "connections.h"
 
 #include <sys/socket.h>

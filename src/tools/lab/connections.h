@@ -1,4 +1,4 @@
-// The open TLS connections, and how to end one of them or all. Any thread.
+// Ends one or all of the open TLS connections. Any thread.
 #pragma once
 
 #include <openssl/ssl.h>
@@ -9,15 +9,15 @@
 
 namespace veltrad::lab {
 
-// The HTTP library keeps its sockets to itself, and waits for idle connections when it stops; so they are
-// learned from OpenSSL: the start of a handshake and the end of an SSL object. Must outlive the context that
-// it watches.
+// The HTTP library does not tell its sockets, and waits for idle connections when it stops. So the sockets
+// are found through OpenSSL, at the start of a handshake and at the end of an SSL object. Must outlive the
+// context.
 class Connections {
  public:
   void watch(SSL_CTX& context);
-  // Ends the connection: no byte more goes out.
+  // Ends a connection; nothing more is sent.
   static void cut(const SSL* connection);
-  // Ends every connection, those that come later included.
+  // Ends every connection, also those that come later.
   void stop();
 
  private:

@@ -1,4 +1,4 @@
-// The lab's dashboard server. One thread of its own.
+// Receives and acknowledges datagrams.
 #include "dashboard.h"
 
 #include <arpa/inet.h>
@@ -19,15 +19,12 @@ constexpr std::size_t kLargestDatagram = 65'536;
 constexpr int kReceiveBufferBytes = 8 << 20;
 constexpr int kDatagramsAtOnce = 256;
 constexpr std::size_t kMostDelayed = 100'000;
-constexpr std::size_t kShortBytes = 61;  // ends inside the event number
+// Ends inside the event number.
+constexpr std::size_t kShortBytes = 61;
 constexpr std::size_t kLongBytes = 2000;
 constexpr std::uint16_t kForeignOffset = 0x4000;
-// How long one that is to be overtaken waits for another.
+// How long a held acknowledgement waits for the next one.
 constexpr std::chrono::milliseconds kLongestHold{1000};
-
-double now() {
-  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
 
 FileDescriptor boundSocket(int port, int& boundPort) {
   FileDescriptor made(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0));
@@ -49,28 +46,24 @@ std::string textOf(const sockaddr_in& address) {
   return text + (":" + std::to_string(ntohs(address.sin_port)));
 }
 
+// In the order of Rule::Acknowledgement.
+constexpr const char* kOutcomes[] = {"acknowledged",
+                                     "acknowledgement dropped",
+                                     "acknowledged twice",
+                                     "acknowledged behind the next one",
+                                     "acknowledgement too short",
+                                     "acknowledgement too long",
+                                     "another event acknowledged",
+                                     "acknowledged from another port"};
+static_assert(std::size(kOutcomes) == static_cast<std::size_t>(Rule::Acknowledgement::stranger) + 1);
+
 const char* outcomeOf(std::string_view datagram, const Rule& rule) {
   if (datagram.size() < kPacketHeaderBytes) return "not acknowledged: no whole header";
   if (!asksForAcknowledgement(datagram)) return "not acknowledged: not asked for";
-  switch (rule.acknowledgement) {
-    case Rule::Acknowledgement::right:
-      return rule.delay.count() > 0 ? "acknowledged late" : "acknowledged";
-    case Rule::Acknowledgement::dropped:
-      return "acknowledgement dropped";
-    case Rule::Acknowledgement::duplicate:
-      return "acknowledged twice";
-    case Rule::Acknowledgement::reordered:
-      return "acknowledged behind the next one";
-    case Rule::Acknowledgement::tooShort:
-      return "acknowledgement too short";
-    case Rule::Acknowledgement::tooLong:
-      return "acknowledgement too long";
-    case Rule::Acknowledgement::foreign:
-      return "another event acknowledged";
-    case Rule::Acknowledgement::stranger:
-      return "acknowledged from another port";
+  if (rule.acknowledgement == Rule::Acknowledgement::right && rule.delay.count() > 0) {
+    return "acknowledged late";
   }
-  return "";
+  return kOutcomes[static_cast<std::size_t>(rule.acknowledgement)];
 }
 
 }  // namespace
@@ -137,7 +130,7 @@ void Dashboard::receive() {
 void Dashboard::handle(const sockaddr_in& from, std::string_view datagram) {
   const Rule rule = _misbehaviour.take(kDashboardPath).value_or(Rule());
   Dictionary line = fieldsOfPacket(datagram);
-  line.set("time", now());
+  line.set("time", secondsNow());
   line.set("from", textOf(from));
   line.set("bytes", std::uint64_t{datagram.size()});
   line.set("outcome", outcomeOf(datagram, rule));
@@ -167,7 +160,7 @@ void Dashboard::acknowledge(const sockaddr_in& from, std::string_view datagram, 
 }
 
 void Dashboard::send(const Acknowledgement& acknowledgement) {
-  // A receiver that has gone is no loss.
+  // The receiver may have gone.
   (void)::sendto(acknowledgement.socket, acknowledgement.bytes.data(), acknowledgement.bytes.size(), 0,
                  reinterpret_cast<const sockaddr*>(&acknowledgement.to), sizeof acknowledgement.to);
   sendHeld();

@@ -1,4 +1,4 @@
-// The lab's dashboard server: takes datagrams in and acknowledges them, well or badly. One thread of its own.
+// The lab's dashboard server: receives datagrams and acknowledges them as the rules say, on its own thread.
 #pragma once
 
 #include <netinet/in.h>
@@ -19,20 +19,18 @@ namespace veltrad::lab {
 // The path that rules for datagrams match.
 inline constexpr const char* kDashboardPath = "/dashboard";
 
-// Owns its thread. Both arguments must outlive it.
+// The arguments must outlive it.
 class Dashboard {
  public:
   Dashboard(Misbehaviour& misbehaviour, Received& lines) : _misbehaviour(misbehaviour), _lines(lines) {}
   ~Dashboard() { stop(); }
-  Dashboard(const Dashboard&) = delete;
-  Dashboard& operator=(const Dashboard&) = delete;
 
-  // Binds to the UDP port of 127.0.0.1 (0: any) and serves. Nothing: it serves; else one line that says why
-  // not.
+  // Binds to a UDP port of 127.0.0.1 (0: any) and serves. Returns one line that says what failed, if anything
+  // did.
   std::optional<std::string> start(int port);
   // Constant after start().
   int port() const { return _port; }
-  // Acknowledgements that wait are given up.
+  // Drops acknowledgements that wait.
   void stop();
 
  private:
@@ -56,14 +54,16 @@ class Dashboard {
   Misbehaviour& _misbehaviour;
   Received& _lines;
   FileDescriptor _socket;
-  FileDescriptor _stranger;  // a socket on another port
-  FileDescriptor _stopping;  // an event descriptor
+  // On another port.
+  FileDescriptor _stranger;
+  FileDescriptor _stopping;
   int _port = 0;
   std::thread _thread;
 
   // Own thread only.
   std::multimap<Time, Acknowledgement> _delayed;
-  std::optional<Acknowledgement> _held;  // goes out behind the next one
+  // Sent after the next one.
+  std::optional<Acknowledgement> _held;
   Time _heldUntil;
 };
 

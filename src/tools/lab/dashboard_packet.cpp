@@ -1,4 +1,4 @@
-// The dashboard's datagrams. Pure functions; any thread.
+// Reads datagrams and makes acknowledgements.
 #include "dashboard_packet.h"
 
 #include <optional>
@@ -60,7 +60,7 @@ std::size_t nextEquals(std::string_view text, std::size_t from) {
   return from < text.size() ? from : std::string_view::npos;
 }
 
-// A key is what stands between "=" and the last blank before it; so one with a blank loses its beginning.
+// A key is the text between "=" and the last blank before it, so a key with a blank loses its beginning.
 Dictionary itemsOf(std::string_view text) {
   Dictionary items;
   std::size_t equals = nextEquals(text, 0);
@@ -68,7 +68,7 @@ Dictionary itemsOf(std::string_view text) {
   while (equals != std::string_view::npos) {
     const std::size_t next = nextEquals(text, equals + 1);
     const std::size_t blank = next == std::string_view::npos ? text.size() : text.rfind(' ', next);
-    // Without a blank it is a key's own "=": the item goes on.
+    // Without a blank the "=" is part of a key, and the item continues.
     const std::size_t end = blank > equals && blank != std::string_view::npos ? blank : text.size();
     items.set(toUTF8(text.substr(key, equals - key)), unescaped(text.substr(equals + 1, end - equals - 1)));
     if (end == text.size()) break;

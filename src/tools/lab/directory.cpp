@@ -1,4 +1,4 @@
-// The lab's directory: its certificate, its signing key, the storebags that a developer edits. Any thread.
+// Sets up the lab's directory and reads its storebags.
 #include "directory.h"
 
 #include <sys/stat.h>
@@ -14,7 +14,7 @@
 namespace veltrad::lab {
 namespace {
 
-// A first storebag to look at and to change: every client reports to this lab, whatever its consent.
+// An example: every client reports to this lab, regardless of consent.
 constexpr std::string_view kExampleStorebag = R"({
   "version": "example-1",
   "release": {
@@ -46,7 +46,6 @@ std::string replaced(std::string text, std::string_view what, const std::string&
   return text;
 }
 
-// As deep as the parsers let it be.
 Value withAddresses(const Value& value, const std::string& url, int dashboardPort) {
   if (const auto* text = value.asString()) {
     if (*text == "${dashboardPort}") return dashboardPort;
@@ -66,7 +65,7 @@ Value withAddresses(const Value& value, const std::string& url, int dashboardPor
   return value;
 }
 
-// A name is one path component of letters, digits, "-" and "_": it never leaves the directory.
+// A name is one path component of letters, digits, "-" and "_", so it never leads out of the directory.
 bool isStorebagName(const std::string& name) {
   const auto plain = [](unsigned char c) { return std::isalnum(c) != 0 || c == '-' || c == '_'; };
   return !name.empty() && std::all_of(name.begin(), name.end(), plain);
@@ -83,18 +82,20 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   return Failure{"no property list: " + value.error().description()};
 }
 
-std::optional<std::string> makeSigningKey(const std::string& privatePath, const std::string& publicPath) {
+Result<config::SigningKey, std::string> signingKeyIn(const std::string& directory) {
+  const std::string privatePath = directory + "/private.pem";
   platform::DiskFileStore files;
   if (!exists(privatePath)) {
     if (const auto written = files.replace(privatePath, config::SigningKey::generate().privatePEM(), 0600);
         !written)
-      return written.error().description;
+      return Failure{written.error().description};
   }
-  const auto key = config::SigningKey::load(privatePath);
-  if (!key) return key.error();
-  if (const auto written = files.replace(publicPath, key.value().publicDER(), 0644); !written)
-    return written.error().description;
-  return std::nullopt;
+  auto key = config::SigningKey::load(privatePath);
+  if (!key) return key;
+  if (const auto written = files.replace(directory + "/publicKey.der", key.value().publicDER(), 0644);
+      !written)
+    return Failure{written.error().description};
+  return key;
 }
 
 }  // namespace
@@ -111,10 +112,7 @@ Result<Directory, std::string> Directory::open(const std::string& path) {
         !written)
       return Failure{written.error().description};
   }
-  const std::string privatePath = path + "/signing/private.pem";
-  if (const auto failure = makeSigningKey(privatePath, path + "/signing/publicKey.der"))
-    return Failure{*failure};
-  auto key = config::SigningKey::load(privatePath);
+  auto key = signingKeyIn(path + "/signing");
   if (!key) return Failure{key.error()};
   Directory directory(path, std::move(key).value());
   if (!exists(directory.certificatePath()) || !exists(directory.certificateKeyPath())) {

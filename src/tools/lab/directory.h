@@ -1,8 +1,8 @@
-// The lab's directory: its certificate, its signing key, the storebags that a developer edits. Any thread.
+// The lab's directory: its certificate, its signing key, and the storebags that a developer edits. Any
+// thread.
 #pragma once
 
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 
@@ -12,22 +12,22 @@
 
 namespace veltrad::lab {
 
-// A storebag as its file says it now.
+// `modified` is in seconds since 1970.
 struct StorebagFile {
   Dictionary storebag;
-  std::int64_t modified;  // seconds since 1970
+  std::int64_t modified;
 };
 
 struct StorebagFailure {
   enum class Kind { notFound, unreadable };
   Kind kind;
-  std::string description;  // one line, names the file and what was expected
+  std::string description;
 };
 
 class Directory {
  public:
-  // Makes what is missing: the certificate with its key, signing/, storebags/ (with an example), received/.
-  // The error is one line that names the path.
+  // Makes what is missing: the certificate with its key, signing/, storebags/ (with an example) and
+  // received/. The error is one line that names the path.
   static Result<Directory, std::string> open(const std::string& path);
 
   std::string certificatePath() const { return _path + "/certificate.pem"; }
@@ -38,8 +38,8 @@ class Directory {
   }
   const config::SigningKey& signingKey() const { return _signingKey; }
 
-  // NAME.plist, else NAME.json, read afresh; every "${url}" in its texts becomes `url`, and a text that is
-  // "${dashboardPort}" the number.
+  // Reads NAME.plist, else NAME.json. Replaces "${url}" in texts by `url`, and a text "${dashboardPort}" by
+  // the number.
   Result<StorebagFile, StorebagFailure> storebag(const std::string& name, const std::string& url,
                                                  int dashboardPort) const;
 

@@ -1,5 +1,4 @@
-// veltra-lab: the servers of the system for development and tests. The main thread waits for the signal to
-// stop.
+// veltra-lab: the servers of the system for development and tests.
 #include <CLI/CLI.hpp>
 
 #include <unistd.h>
@@ -44,7 +43,7 @@ int fail(const std::string& why) {
   return 1;
 }
 
-// Before any other thread, so that all of them leave the signals to sigwait.
+// Called before other threads start, so that only sigwait receives the signals.
 sigset_t blockStopSignals() {
   sigset_t signals;
   sigemptyset(&signals);

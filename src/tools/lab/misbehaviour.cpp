@@ -1,4 +1,4 @@
-// How the lab has been told to misbehave: rules, each for the requests below a path. Any thread.
+// Reads rules and finds the one for a request.
 #include "misbehaviour.h"
 
 #include <algorithm>
@@ -8,7 +8,7 @@
 namespace veltrad::lab {
 namespace {
 
-// Each reader says what it expected, or nothing when the value was read.
+// Each reader returns what it expected if it could not read the value.
 using Wrong = std::optional<std::string>;
 
 Wrong readText(const Value& value, std::string& into) {
@@ -24,11 +24,12 @@ Wrong readBoolean(const Value& value, bool& into) {
   return std::nullopt;
 }
 
-Wrong readInteger(const Value& value, std::int64_t least, std::int64_t most, std::int64_t& into) {
+template <typename Number, typename T>
+Wrong readInteger(const Value& value, std::int64_t least, std::int64_t most, T& into) {
   const auto number = value.isNumber() ? value.toInt64() : std::nullopt;
   if (!number || *number < least || *number > most)
     return "an integer from " + std::to_string(least) + " to " + std::to_string(most);
-  into = *number;
+  into = Number(*number);
   return std::nullopt;
 }
 
@@ -74,8 +75,6 @@ Wrong readHeaders(const Value& value, Dictionary& into) {
 }
 
 Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
-  std::int64_t number = 0;
-  Wrong wrong;
   if (key == "path") return readText(value, rule.path);
   if (key == "cut") return readBoolean(value, rule.cut);
   if (key == "cutHalfway") return readBoolean(value, rule.cutHalfway);
@@ -86,26 +85,13 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   if (key == "ack") return readName(value, kAcknowledgements, rule.acknowledgement);
   if (key == "headers") return readHeaders(value, rule.headers);
   if (key == "body") return readBody(value, rule.body.emplace());
-  if (key == "times") {
-    wrong = readInteger(value, 1, 1'000'000'000, number);
-    rule.times = number;
-  } else if (key == "share") {
-    wrong = readInteger(value, 0, 100, number);
-    rule.share = number;
-  } else if (key == "status") {
-    wrong = readInteger(value, 200, 599, number);
-    rule.status = static_cast<int>(number);
-  } else if (key == "delayMs") {
-    wrong = readInteger(value, 0, 3'600'000, number);
-    rule.delay = std::chrono::milliseconds(number);
-  } else if (key == "dripMs") {
-    wrong = readInteger(value, 0, 3'600'000, number);
-    rule.drip = std::chrono::milliseconds(number);
-  } else {
-    return "one of path, times, share, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
-           "ack, lastModified, headers, body";
-  }
-  return wrong;
+  if (key == "times") return readInteger<std::int64_t>(value, 1, 1'000'000'000, rule.times);
+  if (key == "share") return readInteger<std::int64_t>(value, 0, 100, rule.share);
+  if (key == "status") return readInteger<int>(value, 200, 599, rule.status);
+  if (key == "delayMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.delay);
+  if (key == "dripMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.drip);
+  return "one of path, times, share, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
+         "ack, lastModified, headers, body";
 }
 
 }  // namespace
@@ -154,11 +140,11 @@ void Misbehaviour::reset() {
 }
 
 void Misbehaviour::stop() {
-  const Lock hold(_mutex);
-  _rules.clear();
-  ++_generation;
-  _stopped = true;
-  _changed.notifyAll();
+  {
+    const Lock hold(_mutex);
+    _stopped = true;
+  }
+  reset();
 }
 
 bool Misbehaviour::hold(std::uint64_t generation, std::optional<std::chrono::milliseconds> time) {

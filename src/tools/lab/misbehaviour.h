@@ -1,4 +1,4 @@
-// How the lab has been told to misbehave: rules, each for the requests below a path. Any thread.
+// The rules for the lab's misbehaviour, each for the requests below a path. Any thread.
 #pragma once
 
 #include <chrono>
@@ -15,65 +15,68 @@
 
 namespace veltrad::lab {
 
-// One rule. What is not said is left as it would have been.
+// Its 16 fields are the keys of a rule (see `veltra-lab --help`) and the generation. A default changes
+// nothing.
 struct Rule {
+  // wrong: one bit is inverted; missing: the container has no "signature"; none: the storebag without a
+  // container.
   enum class Signature { right, wrong, missing, none };
-  enum class Acknowledgement {
-    right,
-    dropped,
-    duplicate,
-    reordered,  // goes out behind the next one, or after a second
-    tooShort,   // 61 bytes
-    tooLong,    // 2000 bytes
-    foreign,    // for another event number
-    stranger,   // from another port
-  };
-  std::string path;                   // matches requests whose path starts with it; empty: all
-  std::optional<std::int64_t> times;  // how many requests it is for; absent: until the reset
-  std::optional<std::int64_t> share;  // of its requests it is for so many in a hundred, drawn at random
+  // reordered: sent after the next one, or after a second; foreign: for another event number; stranger: from
+  // another port.
+  enum class Acknowledgement { right, dropped, duplicate, reordered, tooShort, tooLong, foreign, stranger };
+  // A prefix of the request's path.
+  std::string path;
+  // How many requests the rule is applied to; absent: to all until the reset.
+  std::optional<std::int64_t> times;
+  // The percentage of requests that the rule is applied to, drawn at random.
+  std::optional<std::int64_t> share;
   std::optional<int> status;
   std::chrono::milliseconds delay{0};
-  std::optional<std::chrono::milliseconds> drip;  // the body goes out a byte at a time, this far apart
-  bool cut = false;                               // ends the connection without an answer
-  bool cutHalfway = false;                        // ends it in the middle of the body
-  bool stall = false;                             // no answer until the reset
-  bool endless = false;                           // a body without end
-  // wrong: one bit of it is turned; missing: the container has no "signature"; none: the bare storebag, no
-  // container
+  // The body is sent one byte at a time, with this interval.
+  std::optional<std::chrono::milliseconds> drip;
+  bool cut = false;
+  bool cutHalfway = false;
+  // No answer until the reset.
+  bool stall = false;
+  bool endless = false;
   Signature sign = Signature::right;
-  Acknowledgement acknowledgement = Acknowledgement::right;  // of a datagram
-  bool lastModified = true;                                  // false: no "Last-Modified" header
-  std::optional<std::string> body;                           // bytes
-  Dictionary headers;                                        // texts; they replace headers of the same name
-  std::uint64_t generation = 0;  // set by take(): the rules' generation at that time
+  Acknowledgement acknowledgement = Acknowledgement::right;
+  // Whether there is a "Last-Modified" header.
+  bool lastModified = true;
+  std::optional<std::string> body;
+  // Texts that replace headers of the same name.
+  Dictionary headers;
+  // The generation of the rules when take() returned this one.
+  std::uint64_t generation = 0;
 };
 
-// The rule that the JSON object says; else one line that names the key and what was expected.
+// Reads a rule. The error is one line that names the key and what was expected.
 Result<Rule, std::string> ruleFromJSON(std::string_view text);
 
 class Misbehaviour {
  public:
   // A rule for the same path replaces the earlier one.
   void add(Rule rule);
-  // The rule with the longest path that matches, counted down by one; nothing where its share leaves this
-  // request out.
+  // Returns the matching rule with the longest path and counts it down. Nothing if its share excludes this
+  // request.
   std::optional<Rule> take(std::string_view path);
-  // Forgets every rule and lets go whoever waits in hold().
+  // Removes all rules and ends all calls of hold().
   void reset();
-  // As reset(), and nobody waits any more.
+  // Like reset(); then hold() no longer waits.
   void stop();
-  // Waits until the time has passed, or without end where there is none. False: the rules have been reset
-  // since that generation, or the lab stops.
+  // Waits for the given time, or without a limit. False if the rules have been reset since that generation,
+  // or the lab stops.
   bool hold(std::uint64_t generation, std::optional<std::chrono::milliseconds> time);
   bool stopped() const;
-  // Changes with every reset; a body without end lasts as long as it does not change.
+  // Changes with every reset, which ends an endless body.
   std::uint64_t generation() const;
 
  private:
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);
-  std::minstd_rand _draw GUARDED_BY(_mutex);  // never seeded: every run draws alike
+  // Not seeded, so that every run draws the same numbers.
+  std::minstd_rand _draw GUARDED_BY(_mutex);
   std::uint64_t _generation GUARDED_BY(_mutex) = 0;
   bool _stopped GUARDED_BY(_mutex) = false;
 };

@@ -1,4 +1,4 @@
-// The lab's live page. Any thread.
+// Writes the live page.
 #include "page.h"
 
 #include "arrivals.h"

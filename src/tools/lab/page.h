@@ -1,4 +1,4 @@
-// The lab's live page. Any thread.
+// The lab's live page.
 #pragma once
 
 #include <string>
@@ -8,10 +8,10 @@ namespace veltrad::lab {
 
 struct Arrivals;
 
-// A plain page that loads itself anew every two seconds: the addresses of the servers, one a line, and the
-// newest arrivals.
+// A page with the addresses of the servers, one per line, and the newest arrivals. It reloads itself every
+// two seconds.
 std::string livePage(const std::vector<std::string>& addresses, Arrivals& arrivals);
-// Text between tags: what comes from clients is never markup.
+// Escapes a text, so that what clients send is never markup.
 std::string escapedForHTML(const std::string& text);
 
 }  // namespace veltrad::lab

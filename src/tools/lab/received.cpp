@@ -1,4 +1,4 @@
-// What has arrived: one JSON object a line in received/KIND.jsonl, the newest lines in memory. Any thread.
+// Appends arrivals to the file and keeps the newest lines.
 #include "received.h"
 
 #include <fcntl.h>
@@ -18,17 +18,17 @@ constexpr std::size_t kNewestLines = 50;
 constexpr std::size_t kNewestBytes = 4096;
 }  // namespace
 
+double secondsNow() {
+  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
 Received::Received(std::string path) : _path(std::move(path)) {
-  _file = ::open(_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
+  _file.reset(::open(_path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC, 0644));
   struct stat status {};
-  if (_file < 0 || ::fstat(_file, &status) != 0) return;
+  if (!ok() || ::fstat(_file.get(), &status) != 0) return;
   _firstByte = static_cast<std::uint64_t>(status.st_size);
   const Lock hold(_mutex);
   _endByte = _firstByte;
-}
-
-Received::~Received() {
-  if (_file >= 0) ::close(_file);
 }
 
 void Received::add(const Dictionary& arrival, std::string_view body) {
@@ -39,7 +39,7 @@ void Received::add(const Dictionary& arrival, std::string_view body) {
   }
   line.push_back('\n');
   const Lock hold(_mutex);
-  const ssize_t written = ::write(_file, line.data(), line.size());
+  const ssize_t written = ::write(_file.get(), line.data(), line.size());
   if (written != static_cast<ssize_t>(line.size())) {
     std::fprintf(stderr, "%s: could not be appended to: %s\n", _path.c_str(),
                  written < 0 ? std::strerror(errno) : "the disk is full");
@@ -74,7 +74,7 @@ std::uint64_t Received::endByte() const {
 
 std::string Received::read(std::uint64_t offset, std::size_t most) const {
   std::string bytes(most, '\0');
-  const ssize_t got = ::pread(_file, bytes.data(), most, static_cast<off_t>(offset));
+  const ssize_t got = ::pread(_file.get(), bytes.data(), most, static_cast<off_t>(offset));
   bytes.resize(got > 0 ? static_cast<std::size_t>(got) : 0);
   return bytes;
 }
@@ -87,7 +87,7 @@ std::deque<std::string> Received::newest() const {
 std::string bodyAsJSON(const std::string& body) {
   if (body.empty()) return {};
   if (const auto parsed = formats::parseJSON(body)) {
-    // As it came, so that numbers keep their form.
+    // Unchanged, so that numbers keep their form.
     return body.find_first_of("\r\n") == std::string::npos ? body : formats::writeJSON(parsed.value());
   }
   return formats::writeJSON(isUTF8(body) ? Value(body) : Value(Data{body}));

@@ -1,5 +1,4 @@
-// The lab's HTTPS server: storebags, the event collector, log data, uploads, control and the live page. The
-// only file that includes the HTTP library; its threads run the handlers.
+// Handles requests on the threads of the HTTP library, which only this file includes.
 #include "server.h"
 
 #include <httplib.h>
@@ -20,16 +19,13 @@ namespace {
 constexpr std::size_t kMostBodyBytes = 64u << 20;
 constexpr std::size_t kMostUploadBytes = 2u << 30;
 constexpr PropertyListLimits kLogDataLimits{kMostBodyBytes, 64, 500'000, kMostBodyBytes};
-constexpr std::size_t kThreads = 64;  // each open connection holds one
+// Each open connection holds one.
+constexpr std::size_t kThreads = 64;
 constexpr std::size_t kPieceBytes = 64u << 10;
 constexpr std::chrono::milliseconds kLongestWait{60'000};
 constexpr const char* kPlainText = "text/plain; charset=utf-8";
 
-double now() {
-  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
-
-// Without those that the library adds for itself.
+// Without those that the library adds.
 Dictionary headersOf(const httplib::Request& request) {
   Dictionary headers;
   for (const auto& [name, text] : request.headers) {
@@ -42,13 +38,12 @@ Dictionary headersOf(const httplib::Request& request) {
 }
 
 Dictionary arrival(const httplib::Request& request) {
-  return {{"time", now()},
+  return {{"time", secondsNow()},
           {"path", toUTF8(request.target)},
           {"method", request.method},
           {"headers", headersOf(request)}};
 }
 
-// What became of the request, for who reads the lines.
 std::string outcome(const std::optional<Rule>& rule, const Answer& answer) {
   if (rule && rule->stall) return "stalled";
   if (rule && rule->cut) return "cut";
@@ -67,7 +62,7 @@ void refuse(httplib::Response& response, int status, const std::string& why) {
   response.set_content(why + "\n", kPlainText);
 }
 
-// Ends the connection after `sent` bytes of the body: the library closes it when a provider fails.
+// Ends the connection after `sent` bytes of the body, because the library closes it when a provider fails.
 void sendAndEnd(httplib::Response& response, const std::string& body, std::size_t sent,
                 const std::string& type) {
   response.set_content_provider(
@@ -87,7 +82,6 @@ bool isBelow(std::string_view path, std::string_view top) {
   return path.starts_with(top) && (path.size() == top.size() || path[top.size()] == '/');
 }
 
-// The decoded texts by their names.
 Dictionary queryOf(const httplib::Request& request) {
   Dictionary query;
   for (const auto& [name, text] : request.params) query.set(toUTF8(name), toUTF8(text));
@@ -111,13 +105,15 @@ struct Server::Library {
               const httplib::ContentReader& reader);
   void control(const httplib::Request& request, httplib::Response& response, const std::string& body);
   void received(const httplib::Request& request, httplib::Response& response);
-  void send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
-            const std::optional<Rule>& rule);
+  void finish(const httplib::Request& request, httplib::Response& response, const Answer& answer,
+              const std::optional<Rule>& rule, Received& lines, Dictionary line,
+              const std::string& body = {});
   void sendEndless(httplib::Response& response, const Rule& rule, const std::string& type);
   void sendDripping(httplib::Response& response, const Rule& rule, const Answer& answer);
 
   Server& lab;
-  Connections connections;  // before the server, whose context it watches
+  // Declared before the server, whose context it watches.
+  Connections connections;
   httplib::SSLServer http;
   std::thread accepting;
   std::atomic<bool> failed{false};
@@ -139,9 +135,10 @@ void Server::Library::route() {
   http.new_task_queue = [] { return new httplib::ThreadPool(kThreads); };
   http.set_keep_alive_max_count(1'000'000'000);
   http.set_keep_alive_timeout(60);
-  http.set_payload_max_length(kMostUploadBytes);  // smaller bounds are the handlers'
+  // The handlers check smaller bounds.
+  http.set_payload_max_length(kMostUploadBytes);
   http.set_tcp_nodelay(true);
-  // The library's own choice would let a second lab share the port.
+  // By default the library would let a second lab share the port.
   http.set_socket_options([](socket_t socket) {
     const int yes = 1;
     ::setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
@@ -178,22 +175,21 @@ void Server::Library::storebag(const httplib::Request& request, httplib::Respons
   if (rule) applyRule(*rule, answer);
   Dictionary line = arrival(request);
   line.set("name", toUTF8(name));
-  line.set("outcome", outcome(rule, answer));
-  lab._arrivals.storebags.add(line, {});
-  send(request, response, answer, rule);
+  finish(request, response, answer, rule, lab._arrivals.storebags, std::move(line));
 }
 
 void Server::Library::post(const httplib::Request& request, httplib::Response& response,
                            const httplib::ContentReader& reader) {
   if (isBelow(request.path, kUploadPath)) return upload(request, response, reader);
-  std::string body;  // the library has undone the gzip
+  // Decompressed by the library.
+  std::string body;
   const bool whole = reader([&body](const char* bytes, std::size_t length) {
     if (body.size() + length > kMostBodyBytes) return false;
     body.append(bytes, length);
     return true;
   });
   if (!whole) {
-    // What is left of it would be read as the next request.
+    // Otherwise the rest of the body would be read as the next request.
     const bool tooLarge = response.status == 413 || body.size() + kPieceBytes > kMostBodyBytes;
     return refuseAndEnd(response, tooLarge ? 413 : 400,
                         tooLarge ? "a body has at most 64 MiB\n" : "the body is cut short or is no gzip\n");
@@ -214,12 +210,10 @@ void Server::Library::collect(const httplib::Request& request, httplib::Response
   line.set("compressed", request.get_header_value("Content-Encoding") == "gzip");
   line.set("bytes", length.empty() ? std::uint64_t{body.size()}
                                    : std::uint64_t{std::strtoull(length.c_str(), nullptr, 10)});
-  line.set("outcome", outcome(rule, answer));
-  lab._arrivals.events.add(line, bodyAsJSON(body));
-  send(request, response, answer, rule);
+  finish(request, response, answer, rule, lab._arrivals.events, std::move(line), bodyAsJSON(body));
 }
 
-// Answers with the place where the array is said to be stored.
+// Answers with the location where the array is said to be stored.
 void Server::Library::logData(const httplib::Request& request, httplib::Response& response,
                               const std::string& body) {
   const auto rule = lab._misbehaviour.take(request.path);
@@ -230,17 +224,16 @@ void Server::Library::logData(const httplib::Request& request, httplib::Response
   Dictionary line = arrival(request);
   line.set("bytes", std::uint64_t{body.size()});
   line.set("answer", toUTF8(answer.body));
-  line.set("outcome", outcome(rule, answer));
   const auto archive = formats::parsePropertyList(body, kLogDataLimits);
   if (!archive) line.set("problem", archive.error().detail);
-  lab._arrivals.logData.add(line, archive ? formats::writeJSON(archive.value()) : bodyAsJSON(body));
-  send(request, response, answer, rule);
+  finish(request, response, answer, rule, lab._arrivals.logData, std::move(line),
+         archive ? formats::writeJSON(archive.value()) : bodyAsJSON(body));
 }
 
 void Server::Library::upload(const httplib::Request& request, httplib::Response& response,
                              const httplib::ContentReader& reader) {
   Dictionary line = arrival(request);
-  // Else the library would undo the gzip; the request is its own object and not constant there.
+  // Otherwise the library would decompress the body. The request object itself is not constant.
   const_cast<httplib::Request&>(request).headers.erase("Content-Encoding");
   UploadDigest digest;
   const bool whole = reader([&digest](const char* bytes, std::size_t length) {
@@ -257,10 +250,8 @@ void Server::Library::upload(const httplib::Request& request, httplib::Response&
   answer.body = "{\"success\": true}";
   if (rule) applyRule(*rule, answer);
   line.set("query", queryOf(request));
-  line.set("outcome", outcome(rule, answer));
   line.merge(digest.finish());
-  lab._arrivals.uploads.add(line, {});
-  send(request, response, answer, rule);
+  finish(request, response, answer, rule, lab._arrivals.uploads, std::move(line));
 }
 
 void Server::Library::control(const httplib::Request&, httplib::Response& response, const std::string& body) {
@@ -270,7 +261,7 @@ void Server::Library::control(const httplib::Request&, httplib::Response& respon
   response.set_content("{}", "application/json");
 }
 
-// ?kind=events, and with &count=N&waitMs=M only once N lines have come or M milliseconds are over.
+// ?kind=events; with &count=N&waitMs=M it waits for N lines, at most M milliseconds.
 void Server::Library::received(const httplib::Request& request, httplib::Response& response) {
   const std::string kind = request.get_param_value("kind");
   const auto kinds = lab._arrivals.kinds();
@@ -292,8 +283,12 @@ void Server::Library::received(const httplib::Request& request, httplib::Respons
       });
 }
 
-void Server::Library::send(const httplib::Request& request, httplib::Response& response, const Answer& answer,
-                           const std::optional<Rule>& rule) {
+// Records the arrival, then answers it.
+void Server::Library::finish(const httplib::Request& request, httplib::Response& response,
+                             const Answer& answer, const std::optional<Rule>& rule, Received& lines,
+                             Dictionary line, const std::string& body) {
+  line.set("outcome", outcome(rule, answer));
+  lines.add(line, body);
   response.status = answer.status;
   if (rule && rule->delay.count() > 0) lab._misbehaviour.hold(rule->generation, rule->delay);
   if (rule && rule->stall) lab._misbehaviour.hold(rule->generation, std::nullopt);
@@ -315,7 +310,7 @@ void Server::Library::sendEndless(httplib::Response& response, const Rule& rule,
       });
 }
 
-// A byte at a time; the reset sends what is left at once.
+// Sends one byte at a time; after a reset, the rest at once.
 void Server::Library::sendDripping(httplib::Response& response, const Rule& rule, const Answer& answer) {
   response.set_content_provider(answer.body.size(), answer.type,
                                 [this, body = answer.body, apart = rule.drip, generation = rule.generation](
@@ -351,7 +346,8 @@ std::optional<std::string> Server::start(int port, int dashboardPort) {
     port = -1;
   if (port < 0) return "the port is taken or may not be bound; --port 0 takes any free one";
   _url = "https://localhost:" + std::to_string(port);
-  if (auto failure = _dashboard.start(dashboardPort)) return failure;  // first: requests ask for its port
+  // Before requests are accepted, because they need its port.
+  if (auto failure = _dashboard.start(dashboardPort)) return failure;
   _library->accepting = std::thread([this] { _library->failed = !_library->http.listen_after_bind(); });
   while (!http.is_running() && !_library->failed) std::this_thread::sleep_for(std::chrono::milliseconds(1));
   if (_library->failed) return "the server could not accept connections";

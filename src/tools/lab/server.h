@@ -1,5 +1,4 @@
-// The lab's HTTPS server: storebags, the event collector, log data, uploads, control and the live page. Runs
-// on the HTTP library's threads and one that accepts; the library is included in the body alone.
+// The lab's HTTPS server: storebags, the event collector, log data, uploads, control and the live page.
 #pragma once
 
 #include <memory>
@@ -13,33 +12,33 @@
 
 namespace veltrad::lab {
 
-// Owns its threads, the dashboard's too. `directory` must outlive it.
+// Owns its threads and the dashboard's. `directory` must outlive it.
 class Server {
  public:
   Server(const Directory& directory, int maxAge);
   ~Server();
-  Server(const Server&) = delete;
-  Server& operator=(const Server&) = delete;
 
   void add(Rule rule) { _misbehaviour.add(std::move(rule)); }
-  // Binds to the ports of the loopback, TCP and the dashboard's UDP (0: any), and serves. Nothing: it serves;
-  // else one line that says why not.
+  // Binds to the TCP port and the dashboard's UDP port of 127.0.0.1 (0: any) and serves. Returns one line
+  // that says what failed, if anything did.
   std::optional<std::string> start(int port, int dashboardPort);
   const std::string& url() const { return _url; }
   std::string logDataURL() const { return _url + kLogDataPath; }
   std::string uploadURL() const { return _url + kUploadPath; }
   int dashboardPort() const { return _dashboard.port(); }
-  // Ends every connection and every thread; at once, whatever the clients do.
+  // Ends all connections and threads without waiting for clients.
   void stop();
 
  private:
-  struct Library;  // the HTTP library's side
+  // The part that uses the HTTP library, which only the body includes.
+  struct Library;
   static constexpr const char* kLogDataPath = "/logdata";
   static constexpr const char* kUploadPath = "/upload";
 
   const Directory& _directory;
   const int _maxAge;
-  std::string _url;  // set by start(), before any request
+  // Constant after start().
+  std::string _url;
   Misbehaviour _misbehaviour;
   Arrivals _arrivals;
   Dashboard _dashboard;

@@ -1,4 +1,4 @@
-// What an uploaded body is, read piece by piece and kept nowhere. One thread at a time.
+// Hashes and unpacks an uploaded body.
 #include "upload_digest.h"
 
 #include <openssl/evp.h>
@@ -9,7 +9,8 @@
 namespace veltrad::lab {
 namespace {
 
-constexpr int kGzipAlone = 31;  // as inflateInit2 takes it
+// An argument of inflateInit2.
+constexpr int kGzipAlone = 31;
 constexpr std::size_t kPieceBytes = 64u << 10;
 
 std::string hexDigest(EVP_MD_CTX* context) {

@@ -1,4 +1,4 @@
-// What an uploaded body is, read piece by piece and kept nowhere. One thread at a time.
+// Describes an uploaded body, which is read piece by piece and not kept.
 #pragma once
 
 #include <cstdint>
@@ -13,19 +13,17 @@ struct z_stream_s;
 
 namespace veltrad::lab {
 
-// A body that unpacks to more is a problem.
+// A body that unpacks to more is reported as a problem.
 inline constexpr std::uint64_t kMostPlainBytes = 4ull << 30;
 
 class UploadDigest {
  public:
   UploadDigest();
   ~UploadDigest();
-  UploadDigest(const UploadDigest&) = delete;
-  UploadDigest& operator=(const UploadDigest&) = delete;
 
   void add(std::string_view piece);
-  // "bytes" and "sha256" of the body, "plainBytes" and "plainSHA256" of what it unpacks to, or "problem"
-  // where it is no gzip stream, whole and alone. The last call.
+  // "bytes" and "sha256" of the body, and "plainBytes" and "plainSHA256" of what it unpacks to, or a
+  // "problem" if it is not exactly one gzip stream. Called once, at the end.
   Dictionary finish();
 
  private:
@@ -36,7 +34,8 @@ class UploadDigest {
   std::unique_ptr<z_stream_s> _stream;
   std::uint64_t _packedBytes = 0;
   std::uint64_t _plainBytes = 0;
-  bool _ended = false;  // the stream's trailer has come
+  // The end of the stream has been read.
+  bool _ended = false;
   std::string _problem;
 };
 

@@ -1,4 +1,4 @@
-// What the commands of veltra-storebag do. One thread.
+// Reads, checks, signs and shows storebags.
 #include "storebag/commands.h"
 
 #include <fcntl.h>
@@ -10,6 +10,7 @@
 #include <cstring>
 #include <optional>
 
+#include "base/file_descriptor.h"
 #include "config/storebag_container.h"
 #include "config/storebag_key.h"
 #include "config/storebag_signing.h"
@@ -35,19 +36,17 @@ bool exists(const std::string& path) {
   return ::lstat(path.c_str(), &found) == 0;
 }
 
-// Never replaces a file, not even one that appeared meanwhile.
+// Never replaces a file, even if it is made at the same time.
 std::optional<std::string> writeNew(const std::string& path, const std::string& bytes, mode_t mode) {
-  const int descriptor = ::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode);
-  if (descriptor < 0) return path + ": " + std::strerror(errno);
-  const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
-  const bool whole = written == static_cast<ssize_t>(bytes.size()) && ::fsync(descriptor) == 0;
-  ::close(descriptor);
-  if (whole) return std::nullopt;
+  const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, mode));
+  if (!file.isOpen()) return path + ": " + std::strerror(errno);
+  const ssize_t written = ::write(file.get(), bytes.data(), bytes.size());
+  if (written == static_cast<ssize_t>(bytes.size()) && ::fsync(file.get()) == 0) return std::nullopt;
   ::unlink(path.c_str());
   return path + ": could not be written";
 }
 
-// A storebag as it lies in a file, and the bytes to sign for it.
+// A file's content, and the bytes to sign for it.
 struct Bag {
   Value content;
   std::string bytes;
@@ -58,7 +57,7 @@ bool startsLikeJSON(std::string_view bytes) {
   return first != std::string_view::npos && (bytes[first] == '{' || bytes[first] == '[');
 }
 
-// Limits of both readers: the daemon's own are checked by sign().
+// Limits are those of the readers. sign() checks those of the daemon.
 Result<Bag, std::string> readBag(const std::string& path) {
   platform::DiskFileStore files;
   auto bytes = files.read(path, PropertyListLimits{}.bytes);
@@ -84,14 +83,13 @@ std::string bounds() {
                      config::kStorebagBagLimits.depth, config::kStorebagBagLimits.objects);
 }
 
-// The storebag in a container, unverified, or a bare one.
+// The storebag in a container, without verification, or a bare storebag.
 Result<Dictionary, std::string> readStorebag(const std::string& file) {
   const auto bag = readBag(file);
   if (!bag) return Failure{bag.error()};
   const Dictionary* content = bag.value().content.asDictionary();
   if (content == nullptr) return Failure{file + ": no dictionary at its top level"};
-  // A storebag's own entries are dictionaries, its version and its refresh cycle: "bag" as a text is a
-  // container's.
+  // A storebag has no text named "bag", so this is a container.
   const std::string* text = content->string("bag");
   if (text == nullptr) return *content;
   const auto decoded = config::decodeStorebagContainer({std::string(), *text});

@@ -1,4 +1,4 @@
-// What a storebag would do wrong. A value of the wrong type counts as absent, as it does for the daemon.
+// Finds mistakes in a storebag. Like the daemon, it treats a value of the wrong type as absent.
 #include "storebag/lint.h"
 
 #include <fmt/format.h>
@@ -19,28 +19,11 @@ using config::KeyType;
 
 constexpr const char* kNobody = "refuses every client that requires user info";
 
-const char* nameOf(KeyType type) {
-  switch (type) {
-    case KeyType::text:
-    case KeyType::url:
-    case KeyType::names:
-      return "a text";
-    case KeyType::integer:
-    case KeyType::real:
-      return "a number";
-    case KeyType::texts:
-      return "an array of texts";
-    case KeyType::dictionaries:
-      return "an array";
-    case KeyType::dictionary:
-      return "a dictionary";
-    case KeyType::boolean:
-    case KeyType::choice:  // no storebag has them
-    case KeyType::presence:
-      break;
-  }
-  return "anything";
-}
+// In the order of KeyType.
+constexpr const char* kTypeNames[] = {"a text",   "a text",        "a text",   "an array of texts",
+                                      "a number", "a number",      "anything", "a dictionary",
+                                      "an array", "true or false", "a text"};
+static_assert(std::size(kTypeNames) == static_cast<std::size_t>(KeyType::choice) + 1);
 
 bool holdsText(const Array& array) {
   return std::any_of(array.begin(), array.end(), [](const Value& item) { return item.asString(); });
@@ -55,7 +38,6 @@ std::string quoted(const std::string& text) {
   return formats::writeJSON(Value(text));
 }
 
-// Says what it finds in the order of its calls.
 class Lint {
  public:
   void checkStorebag(const Dictionary& storebag) {
@@ -99,7 +81,8 @@ class Lint {
   void checkValue(const std::string& place, const Key& key, const Value& value) {
     const std::string name = quoted(key.name);
     if (!config::fits(value, key.type))
-      return say(place, fmt::format("{} is not {}: counts as absent", name, nameOf(key.type)));
+      return say(place, fmt::format("{} is not {}: counts as absent", name,
+                                    kTypeNames[static_cast<std::size_t>(key.type)]));
     if (key.type == KeyType::texts) {
       for (const Value& item : *value.asArray())
         if (!item.asString())
@@ -115,7 +98,7 @@ class Lint {
 
   void checkRequired(const std::string& place, const Key& key, const Value* value) {
     const bool given = value != nullptr && config::fits(*value, key.type);
-    if (key.type == KeyType::texts) {  // both such lists are of countries
+    if (key.type == KeyType::texts) {  // required lists are of countries
       if (!given || !holdsText(*value->asArray()))
         say(place, fmt::format("no country in \"{}\": {}", key.name, key.byDefault));
     } else if (!given) {
@@ -123,7 +106,7 @@ class Lint {
     }
   }
 
-  // What no key says alone.
+  // Checks what depends on several keys.
   void checkWhole(const std::string& place, const Dictionary& dictionary, const KeyTable& table) {
     if (&table == &config::HTTPSPostProfile::kKeys) {
       const Array* clients = dictionary.array("clients");
@@ -148,7 +131,8 @@ class Lint {
   }
 
   void checkElements(const std::string& place, const Array& elements, const KeyTable& table) {
-    std::string everyones;  // the place of the first client entry that matches everyone
+    // The place of the first client entry that matches every client.
+    std::string everyones;
     for (std::size_t i = 0; i < elements.size(); ++i) {
       const std::string at = fmt::format("{}[{}]", place, i);
       const Dictionary* element = elements[i].asDictionary();

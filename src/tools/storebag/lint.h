@@ -1,4 +1,4 @@
-// What a storebag would do wrong, from its content alone. Pure; any thread.
+// Finds mistakes in the content of a storebag.
 #pragma once
 
 #include <string>
@@ -8,8 +8,8 @@
 
 namespace veltrad::storebag {
 
-// One line for each finding, with the place first ("release.httppost.clients[0]: …"), in the order of the
-// storebag's keys; empty when there is nothing to say. The names of keys are those that the daemon reads.
+// Returns one line for each finding, which begins with the place ("release.httppost.clients[0]: …"), in the
+// order of the storebag's keys.
 std::vector<std::string> lintStorebag(const Dictionary& storebag);
 
 }  // namespace veltrad::storebag

@@ -1,6 +1,5 @@
-// veltra-storebag: makes keys, signs storebags, verifies, shows and looks through them. One thread. Exit
-// status: 0 done, 1 refused, failed or with findings, 2 wrong usage; results on standard output, everything
-// else on standard error.
+// veltra-storebag: makes keys; signs, verifies, shows and checks storebags. The exit status is 0 if done, 1
+// if refused, failed or with findings, 2 for wrong usage.
 #include <CLI/CLI.hpp>
 #include <cstdio>
 #include <exception>

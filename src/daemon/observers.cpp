@@ -1,0 +1,125 @@
+// The table of questions, and who may ask which.
+#include "daemon/observers.h"
+
+#include <fmt/format.h>
+
+#include "daemon/status.h"
+#include "daemon/veltrad_agent.h"
+#include "http/http_queue.h"
+#include "ipc/dispatcher.h"
+#include "ipc/listener.h"
+#include "ipc/pending_reply.h"
+#include "platform/memory_budget.h"
+#include "wire/constants.h"
+#include "wire/names.h"
+
+namespace veltrad::daemon {
+
+namespace question = wire::question;
+
+enum class Right { observe, control };
+
+struct Observers::Question {
+  std::string_view name;
+  Right right;
+  Answer (Observers::*answer)(const Dictionary& arguments);
+};
+
+const Observers::Question* Observers::questionNamed(const std::string& name) {
+  static constexpr Question kQuestions[] = {
+      {question::kStatus, Right::observe, &Observers::status},
+      {question::kSessions, Right::observe, &Observers::sessions},
+      {question::kMetrics, Right::observe, &Observers::metrics},
+  };
+  for (const Question& question : kQuestions) {
+    if (question.name == name) return &question;
+  }
+  return nullptr;
+}
+
+// One connection's questions.
+class Observers::Desk final : public ipc::Observer {
+ public:
+  // The connection holds its desk.
+  Desk(Observers& observers, ipc::Connection& connection) : _observers(observers), _connection(connection) {}
+
+  std::optional<std::string> ask(const std::string& operation, Dictionary arguments,
+                                 std::shared_ptr<ipc::PendingReply> reply) override {
+    const Question* question = questionNamed(operation);
+    if (!question) return ipc::unknownOperation(operation);
+    Answer answer =
+        may(question->right) ? (_observers.*question->answer)(arguments) : refused(question->right);
+    if (!reply) return std::nullopt;
+    if (answer) {
+      reply->answer(std::move(answer.value()));
+    } else {
+      reply->fail(wire::makeReportingError(answer.error(), -1));
+    }
+    return std::nullopt;
+  }
+
+ private:
+  bool holds(const char* entitlement) {
+    const auto value = _connection.valueForEntitlement(entitlement);
+    return value && value->isBoolean() && *value->toBoolean();
+  }
+  bool may(Right right) {
+    return ipc::isOwner(_connection.uid()) || holds(wire::kControlEntitlement) ||
+           (right == Right::observe && holds(wire::kObserveEntitlement));
+  }
+  Answer refused(Right right) {
+    _observers._services.counters.count(wire::Reason::observation_refused);
+    return Failure{fmt::format(
+        "This needs root, the daemon's own user, or the entitlement \"{}\": add a rule for uid {} to {}.",
+        right == Right::control ? wire::kControlEntitlement : wire::kObserveEntitlement, _connection.uid(),
+        _observers._services.root.entitlementsPath())};
+  }
+
+  Observers& _observers;
+  ipc::Connection& _connection;
+};
+
+Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started)
+    : _services(services), _agent(agent), _clients(clients), _started(started) {}
+
+bool Observers::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
+  connection->setObserver(std::make_shared<Desk>(*this, *connection));
+  connection->resume();
+  return true;
+}
+
+double Observers::now() const {
+  return platform::timevalToSeconds(_services.clock.now());
+}
+
+Observers::Answer Observers::status(const Dictionary&) {
+  const DaemonFacts facts{_started,
+                          now(),
+                          {{"connections", _clients.connectionCount(), _clients.mostConnections()},
+                           {"posts", _services.http.underWay(), http::HTTPQueue::kMostEvents},
+                           {"memory", _services.memory.used(), platform::MemoryBounds().all},
+                           descriptorLimit()}};
+  return Dictionary{{"daemon", statusOfDaemon(facts)},
+                    {"storebags", statusOfStorebags(_agent.storebags(), facts.now)},
+                    {"servers", statusOfServers(_services.http.servers())}};
+}
+
+Observers::Answer Observers::sessions(const Dictionary& arguments) {
+  const Value* after = arguments.find("after");
+  return statusOfSessions(_agent, static_cast<std::uint64_t>(after ? after->toInt64().value_or(0) : 0));
+}
+
+Observers::Answer Observers::metrics(const Dictionary&) {
+  return Dictionary{{"text", metricsText()}};
+}
+
+Gauges Observers::gauges() {
+  return {_agent.sessionCount(), _clients.connectionCount(), _services.http.underWay(),
+          _services.memory.used(), _started};
+}
+
+std::string Observers::metricsText() {
+  return daemon::metricsText(_services.counters, gauges(), residentBytes());
+}
+
+}  // namespace veltrad::daemon

@@ -1,0 +1,54 @@
+// What those who look after the device are answered on the control socket.
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "base/result.h"
+#include "base/value.h"
+#include "daemon/metrics.h"
+#include "daemon/services.h"
+#include "ipc/connection.h"
+
+namespace veltrad::ipc {
+class Listener;
+}  // namespace veltrad::ipc
+
+namespace veltrad::daemon {
+
+class VeltradAgent;
+
+// Each connection's thread asks on its own. Nothing of it opens a session or a transaction. What the
+// constructor takes outlives it, the listener of clients included.
+class Observers final : public ipc::ListenerDelegate {
+ public:
+  // `started`: of the process, seconds since 1970.
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started);
+
+  // Whoever connects is accepted; each question asks for its entitlement.
+  bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
+
+  // Any thread.
+  Gauges gauges();
+  // Of all counts, which only grow.
+  std::uint64_t countsTotal() const { return _services.counters.total(); }
+  std::string metricsText();
+
+ private:
+  class Desk;
+  struct Question;
+  using Answer = Result<Dictionary, std::string>;  // or one line that says what is wrong
+
+  static const Question* questionNamed(const std::string& name);
+  Answer status(const Dictionary& arguments);
+  Answer sessions(const Dictionary& arguments);
+  Answer metrics(const Dictionary& arguments);
+  double now() const;
+
+  Services& _services;
+  VeltradAgent& _agent;
+  ipc::Listener& _clients;
+  const double _started;
+};
+
+}  // namespace veltrad::daemon

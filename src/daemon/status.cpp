@@ -1,0 +1,152 @@
+// What the rooms know of themselves, put together for those who ask.
+#include "daemon/status.h"
+
+#include <dirent.h>
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstdio>
+#include <limits>
+#include <memory>
+
+#include "base/version.h"
+#include "config/client_types.h"
+#include "daemon/veltrad_agent.h"
+#include "http/server_records.h"
+#include "wire/constants.h"
+
+namespace veltrad::daemon {
+
+namespace {
+
+constexpr double kNotKnown = std::numeric_limits<double>::quiet_NaN();
+
+Value numberOrNull(const std::optional<double>& number) {
+  return number.value_or(kNotKnown);
+}
+
+Value textOrNull(const std::string* text) {
+  return text ? Value(*text) : Value(kNotKnown);
+}
+
+Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now) {
+  const bool attempted = record.attempted;
+  const double wait = record.fetchSuccessful ? record.maxAge : kSecondsBetweenAttempts;
+  return {{"name", name},
+          {"version", textOrNull(record.version ? &*record.version : nullptr)},
+          {"age", attempted ? std::abs(now - record.fetchTime) : kNotKnown},
+          {"state", !attempted               ? "never"
+                    : record.fetchSuccessful ? "successful"
+                                             : "failed"},
+          {"nextAttempt", attempted ? record.fetchTime + wait : kNotKnown}};
+}
+
+Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
+  const backends::StateVerdict verdict = backend.stateVerdict();
+  const wire::ReasonEntry& reason = wire::entryOf(verdict.reason);
+  const backends::BackendActivity activity = backend.activity();
+  return {{"name", backend.name()},
+          {"state", verdict.state},
+          {"reason", Dictionary{{"name", reason.name}, {"text", reason.text}}},
+          {"held", activity.held},
+          {"underWay", activity.underWay},
+          {"lastOutcome", activity.lastOutcome.empty() ? Value(kNotKnown) : Value(activity.lastOutcome)}};
+}
+
+Dictionary statusOfSession(const ListedSession& listed) {
+  const session::FamilyFacts& facts = listed.facts;
+  const Dictionary* info = facts.sessionInfo.get();
+  const Dictionary* user = facts.userInfo.get();
+  const auto clientType = info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
+  Array backends;
+  if (facts.backends) {
+    for (const auto& [name, backend] : *facts.backends) backends.push_back(statusOfBackend(*backend));
+  }
+  return {{"id", listed.number},
+          {"clientType", clientType ? Value(*clientType) : Value(kNotKnown)},
+          {"sessionID", facts.sessionID},
+          {"clientName", textOrNull(user ? user->string(wire::kVeltraUserInfoClientName) : nullptr)},
+          {"serviceName", textOrNull(user ? user->string(wire::kVeltraUserInfoServiceName) : nullptr)},
+          {"backends", std::move(backends)}};
+}
+
+}  // namespace
+
+std::uint64_t residentBytes() {
+  const std::unique_ptr<FILE, int (*)(FILE*)> file(std::fopen("/proc/self/statm", "re"), std::fclose);
+  unsigned long whole = 0;
+  unsigned long resident = 0;
+  if (!file || std::fscanf(file.get(), "%lu %lu", &whole, &resident) != 2) return 0;
+  return std::uint64_t{resident} * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
+}
+
+Limit descriptorLimit() {
+  rlimit limit{};
+  ::getrlimit(RLIMIT_NOFILE, &limit);
+  std::uint64_t used = 0;
+  if (DIR* directory = ::opendir("/proc/self/fd")) {
+    while (const dirent* entry = ::readdir(directory)) used += entry->d_name[0] != '.';
+    ::closedir(directory);
+    --used;  // the one that it was read through
+  }
+  return {"descriptors", used, limit.rlim_cur};
+}
+
+Dictionary statusOfDaemon(const DaemonFacts& facts) {
+  Array limits;
+  for (const Limit& limit : facts.limits) {
+    limits.push_back(Dictionary{{"name", limit.name}, {"used", limit.used}, {"limit", limit.limit}});
+  }
+  return {{"version", kVersion},
+          {"pid", static_cast<int>(::getpid())},
+          {"uptime", facts.now - facts.started},
+          {"memory", Dictionary{{"resident", residentBytes()}}},
+          {"limits", std::move(limits)}};
+}
+
+Array statusOfStorebags(StorebagCache& cache, double now) {
+  auto records = cache.records();
+  for (std::int32_t type = 0; type < config::kVeltraClientTypeCount; ++type) {
+    if (const char* name = config::storebagNameForClientType(type)) records.try_emplace(name);
+  }
+  Array storebags;
+  for (const auto& [name, record] : records) storebags.push_back(statusOfStorebag(name.c_str(), record, now));
+  return storebags;
+}
+
+Array statusOfServers(const std::vector<http::ServerRecord>& servers) {
+  Array all;
+  for (const http::ServerRecord& server : servers) {
+    all.push_back(Dictionary{{"address", server.address},
+                             {"lastSuccess", numberOrNull(server.lastSuccess)},
+                             {"failures", server.failures}});
+  }
+  return all;
+}
+
+Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after) {
+  // With five back ends each and long names, so many sessions stay below a frame's bounds.
+  constexpr std::size_t kMost = 200;
+  const auto all = agent.sessions();
+  const auto parents = agent.parents();
+  std::map<const session::Aggregation*, std::uint64_t> numbers;
+  for (const ListedSession& listed : all) numbers.emplace(listed.facts.aggregation.get(), listed.number);
+  Array sessions;
+  bool more = false;
+  for (const ListedSession& listed : all) {
+    if (listed.number <= after) continue;
+    if (sessions.size() == kMost) {
+      more = true;
+      break;
+    }
+    Dictionary status = statusOfSession(listed);
+    const auto parent = parents.find(listed.facts.aggregation.get());
+    const auto number = parent == parents.end() ? numbers.end() : numbers.find(parent->second);
+    if (number != numbers.end()) status.set("parent", number->second);
+    sessions.push_back(std::move(status));
+  }
+  return {{"sessions", std::move(sessions)}, {"more", more}};
+}
+
+}  // namespace veltrad::daemon

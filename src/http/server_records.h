@@ -1,0 +1,43 @@
+// How the servers that requests went to have answered of late. Any thread.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/mutex.h"
+
+namespace veltrad::http {
+
+struct ServerRecord {
+  std::string address;                // scheme, host and port where it was given: "https://h.example:8443"
+  std::optional<double> lastSuccess;  // when it last answered with a status below 400, seconds since 1970
+  std::uint64_t failures = 0;         // answers from 400 on and transport errors since then
+};
+
+class ServerRecords {
+ public:
+  // Of this many servers; the one that was not used for the longest time makes room.
+  static constexpr std::size_t kMost = 256;
+
+  // `host`: "name:port", as the URL had it. `now`: seconds since 1970.
+  void ended(const std::string& host, bool success, double now);
+  // By address.
+  std::vector<ServerRecord> all() const;
+
+ private:
+  struct Entry {
+    std::optional<double> lastSuccess;
+    std::uint64_t failures = 0;
+    std::uint64_t lastUse = 0;
+  };
+
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::map<std::string, Entry> _entries GUARDED_BY(_mutex);
+  std::uint64_t _uses GUARDED_BY(_mutex) = 0;
+};
+
+}  // namespace veltrad::http

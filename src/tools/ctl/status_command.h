@@ -1,0 +1,17 @@
+// `veltractl status` and `veltractl metrics`. The main thread.
+#pragma once
+
+#include "tools/ctl/options.h"
+
+namespace veltrad::ctl {
+
+class Interrupt;
+
+// Prints the status of the running daemon once, or with --watch once a second, in place on a terminal, until
+// SIGINT or SIGTERM. The exit status: 0, or 1 where the daemon did not answer.
+int runStatus(const Options& options, Interrupt& interrupt);
+
+// Prints the daemon's metrics as OpenMetrics text. The exit status as above.
+int runMetrics(const Options& options);
+
+}  // namespace veltrad::ctl

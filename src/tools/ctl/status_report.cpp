@@ -1,0 +1,171 @@
+// The running daemon's status, for programs and for people.
+#include "tools/ctl/status_report.h"
+
+#include <fmt/format.h>
+
+#include <cmath>
+#include <cstdint>
+#include <map>
+#include <set>
+#include <vector>
+
+#include "base/text.h"
+
+namespace veltrad::ctl {
+
+namespace {
+
+using Listed = std::map<std::int64_t, std::vector<std::int64_t>>;
+
+std::int64_t number(const Dictionary& from, const char* key) {
+  const Value* value = from.find(key);
+  return value ? value->toInt64().value_or(0) : 0;
+}
+
+// Absent: null.
+std::optional<double> real(const Dictionary& from, const char* key) {
+  const auto value = from.real(key);
+  return value && std::isfinite(*value) ? value : std::nullopt;
+}
+
+std::string text(const Dictionary& from, const char* key, const char* otherwise) {
+  const std::string* value = from.string(key);
+  return escapedForLog(value ? *value : otherwise);
+}
+
+const Array& array(const Dictionary& from, const char* key) {
+  static const Array kNone;
+  const Array* value = from.array(key);
+  return value ? *value : kNone;
+}
+
+Value sessionWithChildren(std::int64_t id, std::map<std::int64_t, Dictionary>& sessions,
+                          const Listed& below) {
+  Dictionary session = std::move(sessions[id]);
+  Array children;
+  if (const auto at = below.find(id); at != below.end()) {
+    for (const std::int64_t child : at->second)
+      children.push_back(sessionWithChildren(child, sessions, below));
+  }
+  session.erase("id");
+  session.erase("parent");
+  session.set("children", std::move(children));
+  return session;
+}
+
+const char* stateName(std::int64_t state) {
+  constexpr const char* kNames[] = {"waiting", "disabled", "reporting", "held"};
+  return state >= 0 && state < 4 ? kNames[state] : "unknown";
+}
+
+void addSession(std::string& out, const Dictionary& session, const std::string& indent) {
+  const auto clientType = real(session, "clientType");
+  out += fmt::format(
+      "\n{}{} {}: {}, client type {}", indent, "session", number(session, "sessionID"),
+      text(session, "clientName", "no client name") + " / " + text(session, "serviceName", "no service name"),
+      clientType ? fmt::format("{}", *clientType) : "unknown");
+  for (const Value& one : array(session, "backends")) {
+    const Dictionary* backend = one.asDictionary();
+    if (!backend) continue;
+    const Dictionary* reason = backend->dictionary("reason");
+    out += fmt::format(
+        "\n{}  {:<13} {} ({} held, {} under way, last: {})", indent, text(*backend, "name", ""),
+        reason ? text(*reason, "text", "") : stateName(number(*backend, "state")), number(*backend, "held"),
+        number(*backend, "underWay"), text(*backend, "lastOutcome", "nothing yet"));
+  }
+  for (const Value& child : array(session, "children")) {
+    if (const Dictionary* dictionary = child.asDictionary()) addSession(out, *dictionary, indent + "    ");
+  }
+}
+
+void addDaemon(std::string& out, const Dictionary& daemon) {
+  const Dictionary* memory = daemon.dictionary("memory");
+  out += fmt::format("veltrad {}, process {}, up {}, {:.1f} MiB resident", text(daemon, "version", "?"),
+                     number(daemon, "pid"), formatDuration(real(daemon, "uptime").value_or(0)),
+                     memory ? static_cast<double>(number(*memory, "resident")) / (1 << 20) : 0.0);
+  for (const Value& one : array(daemon, "limits")) {
+    const Dictionary* limit = one.asDictionary();
+    if (!limit) continue;
+    const double used = static_cast<double>(number(*limit, "used"));
+    const double most = static_cast<double>(number(*limit, "limit"));
+    out += fmt::format("\n  {:<13} {} of {} ({:.0f} %)", text(*limit, "name", ""), number(*limit, "used"),
+                       number(*limit, "limit"), most > 0 ? 100 * used / most : 0);
+  }
+}
+
+void addStorebags(std::string& out, const Array& storebags, double now) {
+  std::size_t never = 0;
+  out += "\n\nStorebags";
+  for (const Value& one : storebags) {
+    const Dictionary* storebag = one.asDictionary();
+    if (!storebag) continue;
+    const auto age = real(*storebag, "age");
+    if (!age) {
+      ++never;
+      continue;
+    }
+    const double wait = real(*storebag, "nextAttempt").value_or(now) - now;
+    out += fmt::format(
+        "\n  {:<13} version {}, {} {} ago, next attempt {}", text(*storebag, "name", ""),
+        text(*storebag, "version", "unknown"),
+        text(*storebag, "state", "") == "successful" ? "fetched" : "fetch failed", formatDuration(*age),
+        wait > 0 ? "not before " + formatDuration(wait) + " from now" : "with the next session");
+  }
+  if (never > 0) out += fmt::format("\n  {} others: no session has asked for them", never);
+}
+
+void addServers(std::string& out, const Array& servers, double now) {
+  if (servers.empty()) return;
+  out += "\n\nServers";
+  for (const Value& one : servers) {
+    const Dictionary* server = one.asDictionary();
+    if (!server) continue;
+    const auto last = real(*server, "lastSuccess");
+    out += fmt::format("\n  {}: last success {}, {} failures since", text(*server, "address", ""),
+                       last ? formatDuration(now - *last) + " ago" : "never", number(*server, "failures"));
+  }
+}
+
+}  // namespace
+
+Array treeOfSessions(Array listed) {
+  std::map<std::int64_t, Dictionary> sessions;
+  for (Value& one : listed) {
+    if (auto session = std::move(one).takeDictionary()) {
+      const std::int64_t id = number(*session, "id");
+      sessions.emplace(id, std::move(*session));
+    }
+  }
+  Listed below;  // 0: of no parent
+  for (const auto& [id, session] : sessions) {
+    const std::int64_t parent = number(session, "parent");
+    below[sessions.contains(parent) ? parent : 0].push_back(id);
+  }
+  Array tree;
+  for (const std::int64_t id : below[0]) tree.push_back(sessionWithChildren(id, sessions, below));
+  return tree;
+}
+
+std::string formatDuration(double seconds) {
+  const auto whole = static_cast<std::int64_t>(std::max(0.0, seconds));
+  constexpr std::int64_t kMinute = 60, kHour = 3600, kDay = 86400;
+  if (whole < kMinute) return fmt::format("{} s", whole);
+  if (whole < kHour) return fmt::format("{} min", whole / kMinute);
+  if (whole < kDay) return fmt::format("{} h {} min", whole / kHour, whole % kHour / kMinute);
+  return fmt::format("{} d {} h", whole / kDay, whole % kDay / kHour);
+}
+
+std::string formatStatus(const Dictionary& status, double now) {
+  std::string out;
+  if (const Dictionary* daemon = status.dictionary("daemon")) addDaemon(out, *daemon);
+  const Array& sessions = array(status, "sessions");
+  out += sessions.empty() ? "\n\nNo session is open." : "\n\nSessions";
+  for (const Value& session : sessions) {
+    if (const Dictionary* dictionary = session.asDictionary()) addSession(out, *dictionary, "  ");
+  }
+  addStorebags(out, array(status, "storebags"), now);
+  addServers(out, array(status, "servers"), now);
+  return out;
+}
+
+}  // namespace veltrad::ctl
