@@ -1,4 +1,4 @@
-// What a reader of binary lists can be told before and after it reads.
+// The number of objects in a property list, as declared and as counted.
 #include "base/property_list.h"
 
 #include "base/property_list_binary.h"

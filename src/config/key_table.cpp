@@ -1,4 +1,4 @@
-// How the values of keys are read.
+// Reads the values of keys.
 #include "config/key_table.h"
 
 #include <algorithm>

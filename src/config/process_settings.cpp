@@ -1,5 +1,4 @@
-// The settings that hold for the life of the process: where they come from and what stands in for them. Any
-// thread.
+// Computes the settings of the process from preferences, the device and deployment.plist.
 #include "config/process_settings.h"
 
 #include <algorithm>
@@ -14,12 +13,11 @@ namespace {
 
 constexpr std::uint32_t kEnvironmentCount = 5;
 constexpr std::uint32_t kInternalEnvironment = 2;
-constexpr std::uint32_t kSeedEnvironment = 3;
 
 constexpr const char* kInternalStorebagHost = "storebags.internal.example";
 constexpr const char* kPublicStorebagHost = "storebags.example";
 
-// A name or an address, with a port or without; what else a URL may hold has no place in a host.
+// A name or an address with an optional port; excludes all other characters of URLs.
 bool looksLikeHost(const std::string& text) {
   return !text.empty() && std::all_of(text.begin(), text.end(), [](char c) {
     return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' ||
@@ -111,10 +109,6 @@ std::optional<std::string> ProcessSettings::deployedStorebagServerURL() {
   const auto host = internal ? storebagHost(*internal) : std::nullopt;
   if (!host) return std::nullopt;
   return "https://" + *host + (*internal ? "/storebags/maple" : "/bags/maple");
-}
-
-bool ProcessSettings::isInternalBuild() {
-  return _device.isInternalBuild();
 }
 
 std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {

@@ -1,4 +1,4 @@
-// Downloads one storebag and verifies its signature. Runs on the caller's thread.
+// Downloads storebags and verifies their signatures.
 #include "config/storebag_download.h"
 
 #include <algorithm>
@@ -20,7 +20,7 @@ constexpr std::chrono::milliseconds kStorebagTimeout{15'000};
 constexpr std::int32_t kDefaultMaxAgeSeconds = 86'400;
 constexpr const char* kNameWithDefault = "quindle";
 
-// Digits after an optional sign, whatever follows; no digits: 0. Kept within 32 bits.
+// The digits after an optional sign; 0 if there are none. Clamped to 32 bits.
 std::int32_t leadingInteger(std::string_view text) {
   constexpr std::int64_t kMost = std::numeric_limits<std::int32_t>::max();
   const bool negative = text.starts_with('-');
@@ -47,7 +47,7 @@ http::HTTPRequest requestForStorebag(std::string url, const std::optional<std::s
   return request;
 }
 
-// True when the server says that the copy is current; otherwise the text has become the answer's.
+// True if the caller's copy is current; otherwise `lastModified` is set to the answer's text.
 bool isNotModified(const http::HTTPResponse& response, std::optional<std::string>& lastModified) {
   const std::optional<std::string_view> header = response.header("Last-Modified");
   if (!header) return false;
@@ -60,7 +60,7 @@ bool isNotModified(const http::HTTPResponse& response, std::optional<std::string
   return false;
 }
 
-// All lines of the header as one.
+// All lines of the header, joined.
 std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   std::optional<std::string> all;
   for (const auto& [name, value] : response.headers) {
@@ -134,7 +134,7 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
                                                     const http::HTTPError& error) const {
   using Kind = http::HTTPError::Kind;
   WholeStorebagAnswer answer;
-  if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
+  if (error.kind == Kind::tooLarge) {  // the server has answered
     answer.maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
     logError("fetchStorebagWithName: Signature is missing");

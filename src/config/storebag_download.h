@@ -1,5 +1,4 @@
-// Downloads one storebag and verifies its signature. Runs on the caller's thread and blocks it for the
-// exchange.
+// Downloads storebags and verifies their signatures. Blocks the caller's thread.
 #pragma once
 
 #include <cstdint>
@@ -14,7 +13,6 @@
 namespace veltrad::http {
 class HTTPClient;
 struct HTTPError;
-struct HTTPResponse;
 }  // namespace veltrad::http
 
 namespace veltrad::support {
@@ -25,12 +23,11 @@ namespace veltrad::config {
 
 class ProcessSettings;
 
-// The lifetime in seconds that a "Cache-Control" value allows: the leading integer of the component after the
-// first "max-age", components ending at every "=" and every space; kept within 32 bits. 86,400 where there is
-// none.
+// The lifetime in seconds by a "Cache-Control" value: the leading integer of the component after the first
+// "max-age", where components end at every "=" and every space; clamped to 32 bits. 86,400 if there is none.
 std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl);
 
-// What stands in for the storebag "quindle" while its server cannot be reached.
+// Replaces the storebag "quindle" while its server cannot be reached.
 Dictionary defaultStorebag();
 
 struct WholeStorebagAnswer : StorebagAnswer {
@@ -38,13 +35,13 @@ struct WholeStorebagAnswer : StorebagAnswer {
   std::string container;  // its signed bytes; empty for a default storebag
 };
 
-// Keeps no state between calls; any number of threads at once. What the constructor takes must outlive it.
+// Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
+// it.
 class StorebagDownload {
  public:
   StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  // `lastModified`, the "Last-Modified" text of the copy
-  // that the caller holds, makes the request conditional.
+  // `lastModified`, the "Last-Modified" text of the caller's copy, makes the request conditional.
   WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
                                             const std::optional<std::string>& lastModified);
 

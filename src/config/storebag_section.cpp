@@ -1,4 +1,4 @@
-// Picks from a client type's storebag the section of the process's environment. The caller's thread.
+// Selects the section of the process's environment from a storebag.
 #include "config/storebag_section.h"
 
 #include <iterator>
@@ -15,10 +15,9 @@
 namespace veltrad::config {
 namespace {
 
-constexpr std::uint32_t kSeedEnvironment = 3;
 constexpr std::uint32_t kReleaseEnvironment = 4;
 
-// By the number of its environment; null: none.
+// The section of an environment; null if there is none.
 const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
   const std::optional<Dictionary>* sections[] = {&storebag.development, &storebag.flornInternal,
                                                  &storebag.seed, &storebag.release};

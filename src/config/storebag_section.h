@@ -1,4 +1,4 @@
-// Picks from a client type's storebag the section of the process's environment. The caller's thread.
+// Downloads the storebag of a client type and selects the section of the process's environment.
 #pragma once
 
 #include "config/storebag_download.h"

@@ -101,19 +101,21 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
-           daemon::MetricsFile& metricsFile, platform::RunLoop& loop, daemon::Daemon& daemon) {
+void serve(daemon::Services& services, daemon::VeltradAgent& agent, ipc::Listener& listener,
+           platform::CountersFile& countersFile, daemon::MetricsFile& metricsFile, platform::RunLoop& loop,
+           daemon::Daemon& daemon) {
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  // Connections free memory on their own threads after their sessions have gone, so memory is returned
-  // several times.
+  // The last threads may still be ending.
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
   const auto onTick = [&] {
     countersFile.writeSoon();
     metricsFile.writeSoon();
-    const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
+    // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
+    const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
+                      services.memory.used() == 0 && services.http.underWay() == 0;
     // Detects sessions that came and went between two ticks.
     const std::uint64_t acceptedNow = agent.acceptedSessions();
     if (!idle || acceptedNow != accepted) {
@@ -210,7 +212,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), countersFile, metricsFile, loop, daemon);
+  serve(services, daemon.agent(), listener, countersFile, metricsFile, loop, daemon);
 
   const bool ended = stop(services, listener, control, countersFile);
   daemon.backends().sayRest();

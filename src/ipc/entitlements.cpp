@@ -1,4 +1,4 @@
-// The rules of who may do what. Any thread; the file is reread when it changed.
+// Reads the entitlement rules and applies them to peers.
 #include "ipc/entitlements.h"
 
 #include <algorithm>
@@ -10,7 +10,7 @@ namespace veltrad::ipc {
 
 namespace {
 
-// An id exactly: no boolean, no real, nothing that would have to be wrapped.
+// Only an integer within the range of IDs.
 std::optional<unsigned> idOf(const Value& value) {
   if (value.type() != Value::Type::signedInteger && value.type() != Value::Type::unsignedInteger)
     return std::nullopt;
@@ -19,7 +19,7 @@ std::optional<unsigned> idOf(const Value& value) {
   return static_cast<unsigned>(*number);
 }
 
-// A condition of the wrong type is never met: read as absent, it would make the rule wider.
+// A condition of the wrong type never matches: ignoring it would make the rule grant more.
 bool matches(const Dictionary& rule, const Peer& peer) {
   const Value* uid = rule.find("uid");
   const Value* gid = rule.find("gid");
@@ -37,7 +37,7 @@ bool matches(const Dictionary& rule, const Peer& peer) {
   return true;
 }
 
-// Why the rule can never grant anything; nothing when it can.
+// Says why the rule can never grant anything; absent if it can.
 std::optional<std::string> problemOf(const Value& value) {
   const Dictionary* rule = value.asDictionary();
   if (!rule) return "expected a dictionary";
@@ -113,7 +113,7 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
 
 Entitlements::Entitlements(platform::FileStore& files, const std::string& path) : _file(files, path) {}
 
-// Logged once the lock is released.
+// Log lines, written after the lock was released.
 struct Entitlements::Said {
   std::optional<std::string> error;
   std::optional<std::string> shortage;

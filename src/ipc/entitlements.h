@@ -25,7 +25,7 @@ class Entitlements {
   Entitlements(platform::FileStore& files, const std::string& path);
   // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
-  // False: no rule grants it to this user, whatever groups and unit a process of his has.
+  // False if no rule can grant it to this user, whatever the groups and the unit of the process.
   bool mayHold(std::string_view name, unsigned uid);
   // Reads the file now, whether it has changed or not.
   void readAgain();
@@ -42,7 +42,7 @@ class Entitlements {
   platform::LimitedLine _shortages{"questions"};
 };
 
-// The decisions alone; exposed for their tables of tests.
+// The decisions, exposed for tests.
 bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid);
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
 

@@ -9,7 +9,7 @@ namespace veltrad::platform {
 
 namespace {
 
-// No machine says "ReleaseType".
+// No machine states "ReleaseType".
 std::optional<std::string> factOf(MachineFacts& machine, std::string_view key) {
   if (key == "ProductVersion") return machine.productVersion();
   if (key == "BuildVersion") return machine.buildVersion();
@@ -28,7 +28,7 @@ MachineProperties::MachineProperties(FileStore& files, const std::string& device
 
 DeviceProperty MachineProperties::value(std::string_view key) {
   const auto list = configured();
-  // The machine is not asked instead: it may say something else.
+  // The machine's value does not stand in: it may differ.
   if (!list) return Failure{list.error()};
   const std::string* text = list.value().string(key);
   if (!text) return fromMachine(key);

@@ -1,4 +1,4 @@
-// The device property service: facts about this device by key. Any thread.
+// The device property service: facts about this device by key. Any thread may ask.
 #pragma once
 
 #include <map>
@@ -14,8 +14,8 @@
 
 namespace veltrad::platform {
 
-// Nothing where there is no value. A failure is a shortage: for now nobody can say, and it is no answer that
-// may be remembered.
+// Absent if there is no value. A failure is a shortage: the value cannot be determined now, and the failure
+// must not be cached.
 using DeviceProperty = Result<std::optional<std::string>, FileFailure>;
 
 class DeviceProperties {

@@ -1,4 +1,4 @@
-// Files on disk. Any thread; no state of its own.
+// Reads and replaces files on disk.
 #include "platform/file_store.h"
 
 #include <fcntl.h>
@@ -40,23 +40,12 @@ std::string directoryOf(const std::string& path) {
   return slash == 0 ? "/" : path.substr(0, slash);
 }
 
-// 0, or errno.
-int writeAll(int descriptor, std::string_view bytes) {
-  while (!bytes.empty()) {
-    const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return errno;
-    bytes.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return 0;
-}
-
-// A full disk or a quota may show at the sync or the close alone.
+// 0, or an errno. A full disk or a quota may show only at the sync or the close.
 int writeNewFile(const std::string& path, std::string_view bytes, unsigned mode) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (!file.isOpen()) return errno;
   int error = writeAll(file.get(), bytes);
-  if (error == 0 && ::fchmod(file.get(), mode) != 0) error = errno;  // exactly `mode`, whatever the umask
+  if (error == 0 && ::fchmod(file.get(), mode) != 0) error = errno;  // regardless of the umask
   if (error == 0 && ::fsync(file.get()) != 0) error = errno;
   if (::close(file.release()) != 0 && error == 0) error = errno;
   if (error != 0) ::unlink(path.c_str());
@@ -67,7 +56,7 @@ int syncDirectory(const std::string& path) {
   const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!directory.isOpen()) return errno;
   if (::fsync(directory.get()) == 0) return 0;
-  return errno == EINVAL ? 0 : errno;  // EINVAL: a file system that has nothing to sync here
+  return errno == EINVAL ? 0 : errno;  // EINVAL: the file system does not support it
 }
 
 std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
@@ -78,7 +67,7 @@ std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
   return hash;
 }
 
-// NAME.XXXXXXXX.new, as replace() makes them.
+// NAME.XXXXXXXX.new, as replace() makes it.
 bool isUnfinishedName(std::string_view name) {
   constexpr std::size_t kDigits = 8;
   constexpr std::string_view kEnd = ".new";
@@ -91,7 +80,7 @@ bool isUnfinishedName(std::string_view name) {
 }  // namespace
 
 Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, std::size_t most) {
-  // O_NONBLOCK: a pipe under that name must not hold the caller.
+  // O_NONBLOCK: a pipe of this name must not block the caller.
   const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!file.isOpen()) return Failure{failureOf(path, errno)};
   struct stat status {};
@@ -101,7 +90,7 @@ Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, st
   }
   if (static_cast<std::uint64_t>(status.st_size) > most) return Failure{tooLarge(path, most)};
 
-  // The size is a hint alone: it is 0 under /proc, and a file may grow.
+  // The size is only a hint: it is 0 under /proc, and a file may grow.
   std::string bytes;
   std::size_t length = 0;
   std::size_t room = static_cast<std::size_t>(status.st_size) + 1;
@@ -165,7 +154,7 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
     const std::string part = path.substr(0, end);
     if (::mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
       const int error = errno;
-      // A parent on a read-only or closed file system that is there already is none of our concern.
+      // An existing parent on a read-only or inaccessible file system is no error.
       struct stat status {};
       if (::stat(part.c_str(), &status) != 0) return Failure{failureOf(part, error)};
     }

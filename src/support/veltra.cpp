@@ -1,4 +1,4 @@
-// The client library's facts, from its resources and the preferences. Any thread.
+// Facts about the client library, from its resources and the preferences.
 #include "support/veltra.h"
 
 #include "base/version.h"

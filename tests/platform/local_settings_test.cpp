@@ -84,6 +84,7 @@ TEST(LocalSettings, AreOneContentUntilItChangesAndNoShortageChangesIt) {
   files.failReads(kJSON, FakeFileStore::Kind::noAccess);
   settings.readAgain();
   EXPECT_EQ(settings.content().value()->error, "/etc/x.json: Permission denied");
+  files.failReads(kJSON, {});
   files.remove(kJSON);
   files.remove(kList);
   EXPECT_EQ(settings.content().value()->kind, Kind::absent);
@@ -99,10 +100,10 @@ TEST(LocalSettings, NameThePlacesOfKeysAndElementsInJSON) {
                                                                     {{"a"}, ":2:3"},
                                                                     {{"a", "b"}, ":2:9"},
                                                                     {{"a", "a\"\\"}, ":2:17"},
-                                                                    {{"a", "a\"\\", "0"}, ":2:26"},
-                                                                    {{"a", "a\"\\", "1"}, ":2:30"},
-                                                                    {{"a", "a\"\\", "1", "c"}, ":2:31"},
-                                                                    {{"a", "a\"\\", "2"}, ":2:41"},
+                                                                    {{"a", "a\"\\", "0"}, ":2:27"},
+                                                                    {{"a", "a\"\\", "1"}, ":2:31"},
+                                                                    {{"a", "a\"\\", "1", "c"}, ":2:32"},
+                                                                    {{"a", "a\"\\", "2"}, ":2:43"},
                                                                     {{"é", "1"}, ":3:15"},
                                                                     {{"b"}, ":3:20"},
                                                                     {{"c"}, ""},
