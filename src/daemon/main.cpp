@@ -66,7 +66,8 @@ bool makeDirectories(const platform::Root& root) {
 
 // Called after the daemon has taken its lock, because another daemon may be writing the files before.
 void removeUnfinishedFiles(const platform::Root& root) {
-  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory()}) {
+  for (const std::string& directory :
+       {root.runDirectory(), root.stateDirectory(), root.preferencesDirectory(), root.storebagsDirectory()}) {
     const std::size_t removed = platform::removeUnfinishedFiles(directory);
     if (removed > 0) logInfo("main: %zu unfinished files removed from %s", removed, directory.c_str());
   }
@@ -109,7 +110,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
-  loop.run(tick, [&] {
+  const auto onTick = [&] {
     countersFile.writeSoon();
     metricsFile.writeSoon();
     // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
@@ -126,6 +127,10 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
       platform::returnFreeMemory();
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
+  };
+  loop.run(tick, onTick, [&] {
+    logInfo("main: SIGHUP, configuration is read again");
+    daemon.readConfigurationAgain();
   });
 }
 
