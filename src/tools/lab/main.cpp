@@ -6,6 +6,7 @@
 #include <csignal>
 #include <cstdio>
 
+#include "base/version.h"
 #include "directory.h"
 #include "formats/json.h"
 #include "server.h"
@@ -88,6 +89,7 @@ int main(int argc, char** argv) {
   int maxAge = 86'400;
   std::vector<std::string> rules;
   CLI::App app{kAbout, "veltra-lab"};
+  app.set_version_flag("--version", std::string("veltra-lab ") + veltrad::kVersion, "Print the version");
   app.add_option("--dir", path, "Directory for the certificate, keys, storebags and received data")
       ->capture_default_str();
   app.add_option("--port", port, "HTTPS port; 0: any free port")
