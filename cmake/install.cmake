@@ -1,4 +1,4 @@
-# What cmake --install puts where, by component: daemon, library, development, tools, lab. Everything is relative to
+# What cmake --install puts where, by component: daemon, library, development, tools, lab, python. Everything is relative to
 # the prefix, except that /usr has its configuration in /etc.
 include(CMakePackageConfigHelpers)
 
@@ -55,9 +55,10 @@ install(FILES ${MADE}/VeltraConfig.cmake ${MADE}/VeltraConfigVersion.cmake DESTI
         COMPONENT development)
 install(EXPORT Veltra FILE VeltraTargets.cmake NAMESPACE Veltra:: DESTINATION ${CONFIG_DIRECTORY} COMPONENT development)
 
-# ---- Tools, lab ----
+# ---- Tools, lab, Python ----
 install(TARGETS veltractl veltra-storebag RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)
 if(VELTRA_LAB)
   install(TARGETS veltra-lab RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT lab)
   veltra_install_unit(lab veltra-lab.service)
 endif()
+install(DIRECTORY python/veltra DESTINATION ${PYTHON_DIRECTORY} COMPONENT python PATTERN __pycache__ EXCLUDE)
