@@ -14,18 +14,20 @@ namespace veltrad::backends {
 
 namespace {
 // A device of this product type has no adaptor.
-constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+[[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 }  // namespace
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
-    std::int32_t clientType, const BackendOwner& owner) {
+    [[maybe_unused]] std::int32_t clientType, [[maybe_unused]] const BackendOwner& owner) {
   const std::string family = productFamily.value_or("");
+#ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName(
         {_services.random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, owner},
         name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
+#endif
   if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
                                         _services.counters, _services.scratchDirectory},
@@ -44,10 +46,12 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
                                        family);
   }
+#ifdef VELTRA_ADAPTOR
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
                                      family, clientType);
   }
+#endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;
 }
