@@ -9,6 +9,7 @@
 #include "base/version.h"
 #include "directory.h"
 #include "formats/json.h"
+#include "platform/service_manager.h"
 #include "server.h"
 
 namespace {
@@ -74,6 +75,7 @@ int serve(const Directory& directory, int port, int dashboardPort, int maxAge,
                                  {"pid", static_cast<long>(getpid())}};
   std::printf("%s\n", veltrad::formats::writeJSON(line).c_str());
   std::fflush(stdout);
+  veltrad::platform::ServiceManager().ready();
   int signal = 0;
   sigwait(&signals, &signal);
   server.stop();
