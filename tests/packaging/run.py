@@ -4,6 +4,7 @@ section to a first message, tries what the units forbid, upgrades over a running
 Needs root, cgroup v2 and minutes; fewer with a directory as argument that debootstrap has made before, which is copied. The last
 line is "N passed, N failed"."""
 import os
+import plistlib
 import re
 import shutil
 import subprocess
@@ -143,11 +144,14 @@ class Test:
         wait_until(lambda: "message taken in" in self.box.run(stats, check=False, user="nobody"), "the counters")
 
     def test_python_tools_and_reload(self):
-        preferences = "/var/lib/veltrad/preferences/com.florn.veltra.plist"
-        self.box.run(f"sed -i 's|<dict>|<dict><key>DiagnosticLogSubmissionEnabled</key><true/>|' {preferences}")
+        preferences = self.box.path / "var/lib/veltrad/preferences/com.florn.veltra.plist"
+        preferences.write_bytes(plistlib.dumps({**plistlib.loads(preferences.read_bytes()),
+                                                "DiagnosticLogSubmissionEnabled": True}))
+        self.box.run("sed -i '/override_dnu/d' /var/lib/veltra-lab/storebags/quindle.json\n"  # consent, and a readable copy
+                     "systemctl set-environment LANG=en_US.UTF-8; systemctl restart veltrad")
         self.box.run("""python3 -c '
 import veltra
-with veltra.Session(client_type=7, client_name="snake") as session:
+with veltra.Session(client_type=7, client_name="phone", service_name="snake", require_user_info=True) as session:
     assert session.start() == ["httppost"]
     assert session.send(5, 77)'""")
         self.received('"_status":77')
