@@ -206,7 +206,7 @@ with veltra.Session(client_type=7, client_name="phone", service_name="snake", re
         assert "inactive" in self.box.run("systemctl is-active veltrad.service veltrad.socket", check=False)
         assert not (self.box.path / "usr/libexec/veltrad").exists()
         assert (self.box.path / "etc/veltrad/ca.pem").exists(), "removal alone keeps the configuration"
-        self.box.run("systemctl stop veltra-lab; apt-get purge -q -y " + " ".join(PACKAGES))
+        self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
         left = self.box.run("find / /run -xdev -name '*veltra*' -not -path '/packages/*' -o -xdev -name mobile").split()
         assert not left, left
         assert "0 loaded" in self.box.run("systemctl --failed 'veltra*'")
