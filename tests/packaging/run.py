@@ -209,7 +209,7 @@ with veltra.Session(client_type=7, client_name="phone", service_name="snake", re
         self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
         left = self.box.run("find / /run -xdev -name '*veltra*' -not -path '/packages/*' -o -xdev -name mobile").split()
         assert not left, left
-        assert "0 loaded" in self.box.run("systemctl --failed 'veltra*'")
+        assert "0 loaded" in self.box.run("systemctl list-units --failed 'veltra*'")
 
 
 def main():
