@@ -15,7 +15,7 @@ namespace veltrad::backends {
 
 namespace {
 // Devices of this product type have no adaptor.
-constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+[[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 
 // The one draw that a back end takes, decided before.
 class FixedDraw final : public platform::Random {
@@ -38,17 +38,20 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
 
 std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    const SessionFacts& facts, bool oneShot) {
+                                                    const SessionFacts& facts,
+                                                    [[maybe_unused]] bool oneShot) {
   const std::string family = productFamily.value_or("");
   const auto stable =
       _services.sampling ? _services.sampling->stableFactor(facts.compType, name) : std::nullopt;
   FixedDraw fixed(stable.value_or(0));
   platform::Random& random = stable ? fixed : _services.random;
+#ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
                                            _logData, _dashboards, facts.account, oneShot},
                                           name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
+#endif
   if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName(
         {random, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
@@ -66,10 +69,12 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
   if (name == wire::kVeltraBackendAmpery) {
     return AmperyBackend::initWithName(_services.energyLog, _services.counters, random, name, family);
   }
+#ifdef VELTRA_ADAPTOR
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
     return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
                                      facts.compType);
   }
+#endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;
 }

@@ -153,21 +153,20 @@ bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& co
   return stuck == 0 && written;
 }
 
-// The exit status, if the arguments ask for no service.
-std::optional<int> answerArguments(int count, char** arguments) {
-  if (count <= 1) return std::nullopt;
-  const std::string_view argument = arguments[1];
-  if (count == 2 && argument == "--version") {
-    fmt::print("veltrad {}\n", kVersion);
-    return 0;
+// Prints what one of the two known arguments asks for. False: there is none, and others are not read.
+bool answerArguments(int count, char** arguments) {
+  for (int i = 1; i < count; ++i) {
+    const std::string_view argument = arguments[i];
+    if (argument == "--version") {
+      fmt::print("veltrad {}\n", kVersion);
+      return true;
+    }
+    if (argument == "--help") {
+      fmt::print("{}", kHelp);
+      return true;
+    }
   }
-  if (count == 2 && argument == "--help") {
-    fmt::print("{}", kHelp);
-    return 0;
-  }
-  fmt::print(stderr, "veltrad: unexpected argument \"{}\": expected --version, --help, or none\n",
-             arguments[count == 2 ? 1 : 2]);
-  return 2;
+  return false;
 }
 
 }  // namespace
@@ -177,7 +176,7 @@ int main(int count, char** arguments) {
   platform::keepEnvironment({"VELTRA_ROOT", "VELTRA_LOG", "VELTRA_LOG_TARGET", "VELTRA_SANDBOX", "LC_ALL",
                              "LC_MESSAGES", "LANG", "TZ", "NOTIFY_SOCKET", "LISTEN_PID", "LISTEN_FDS",
                              "LISTEN_FDNAMES", "WATCHDOG_PID", "WATCHDOG_USEC", "JOURNAL_STREAM"});
-  if (const auto status = answerArguments(count, arguments)) return *status;
+  if (answerArguments(count, arguments)) return 0;
   platform::takeUtilitySchedulingClass();
   platform::shareHeaps();
   platform::VeltraLogging::startLogging("veltrad", "Daemon");

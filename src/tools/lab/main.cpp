@@ -5,8 +5,10 @@
 #include <csignal>
 #include <cstdio>
 
+#include "base/version.h"
 #include "directory.h"
 #include "formats/json.h"
+#include "platform/service_manager.h"
 #include "server.h"
 
 namespace {
@@ -72,6 +74,7 @@ int serve(const Directory& directory, int port, int dashboardPort, int maxAge,
                                  {"pid", static_cast<long>(getpid())}};
   std::printf("%s\n", veltrad::formats::writeJSON(line).c_str());
   std::fflush(stdout);
+  veltrad::platform::ServiceManager().ready();
   int signal = 0;
   sigwait(&signals, &signal);
   server.stop();
@@ -87,6 +90,7 @@ int main(int argc, char** argv) {
   int maxAge = 86'400;
   std::vector<std::string> rules;
   CLI::App app{kAbout, "veltra-lab"};
+  app.set_version_flag("--version", std::string("veltra-lab ") + veltrad::kVersion, "Print the version");
   app.add_option("--dir", path, "Directory for the certificate, keys, storebags and received data")
       ->capture_default_str();
   app.add_option("--port", port, "HTTPS port; 0: any free port")

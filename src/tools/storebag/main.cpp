@@ -5,6 +5,7 @@
 #include <exception>
 #include <string>
 
+#include "base/version.h"
 #include "config/storebag_signing.h"
 #include "storebag/commands.h"
 
@@ -21,6 +22,7 @@ struct Arguments {
 };
 
 void describe(CLI::App& app, Arguments& given) {
+  app.set_version_flag("--version", std::string("veltra-storebag ") + veltrad::kVersion, "Print the version");
   app.require_subcommand(1);
   CLI::App* keygen =
       app.add_subcommand("keygen", "Create a signing key: DIR/privateKey.pem and DIR/publicKey.der");
