@@ -13,7 +13,7 @@ RUNGS = [line.split() for line in re.findall(r"^veltra_rung\((.*)\)$", (ROOT / "
 RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
 # Kinds of back ends, which must not include each other.
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
-LONGEST_BODY = 400
+LONGEST_BODY = 380
 LONGEST_HEADER = 300
 
 

@@ -9,22 +9,17 @@
 #include <openssl/provider.h>
 #include <openssl/rsa.h>
 
+#include "base/freed.h"
+
 namespace veltrad::config {
 namespace {
 
-template <auto Free>
-struct Deleter {
-  template <typename T>
-  void operator()(T* object) const {
-    Free(object);
-  }
-};
-using LibraryContext = std::unique_ptr<OSSL_LIB_CTX, Deleter<OSSL_LIB_CTX_free>>;
-using Provider = std::unique_ptr<OSSL_PROVIDER, Deleter<OSSL_PROVIDER_unload>>;
-using PublicKey = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
-using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
-using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
-using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
+using LibraryContext = Owned<OSSL_LIB_CTX, OSSL_LIB_CTX_free>;
+using Provider = Owned<OSSL_PROVIDER, OSSL_PROVIDER_unload>;
+using PublicKey = Owned<EVP_PKEY, EVP_PKEY_free>;
+using Number = Owned<BIGNUM, BN_free>;
+using Decoder = Owned<OSSL_DECODER_CTX, OSSL_DECODER_CTX_free>;
+using DigestContext = Owned<EVP_MD_CTX, EVP_MD_CTX_free>;
 
 const unsigned char* bytesOf(std::string_view text) {
   return reinterpret_cast<const unsigned char*>(text.data());

@@ -30,6 +30,18 @@ const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment)
   return *sections[place] ? &**sections[place] : nullptr;
 }
 
+// Completes the answer with the section of the environment, if there is one. Returns the storebag for its
+// other keys.
+Storebag takeSection(const Dictionary& whole, std::uint32_t environment, StorebagSectionAnswer& answer) {
+  auto storebag = parsed<Storebag>(whole);
+  if (const Dictionary* section = sectionOf(storebag, environment)) {
+    answer.kind = StorebagAnswer::Kind::fetched;
+    answer.section = parseSection(*section);
+    answer.version = storebag.version;
+  }
+  return storebag;
+}
+
 }  // namespace
 
 StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
@@ -74,9 +86,8 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     answer.attempted = false;
     return answer;
   }
-  const auto storebag = parsed<Storebag>(whole.storebag);
-  const Dictionary* section = sectionOf(storebag, *environment);
-  if (section == nullptr) {
+  const Storebag storebag = takeSection(whole.storebag, *environment, answer);
+  if (answer.kind != Kind::fetched) {
     const char* sectionName = sectionNameForEnvironment(*environment);
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
@@ -84,9 +95,6 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
         clientType, sectionName != nullptr ? sectionName : "(null)");
     return answer;
   }
-  answer.kind = Kind::fetched;
-  answer.section = parseSection(*section);
-  answer.version = storebag.version;
   if (storebag.refreshCycle) {
     answer.maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
     logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
@@ -114,12 +122,8 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) return kept;
   kept.known = true;
-  const auto storebag = parsed<Storebag>(whole.value());
-  const Dictionary* section = sectionOf(storebag, *environment);
-  if (section == nullptr) return kept;
-  kept.answer.kind = StorebagAnswer::Kind::fetched;
-  kept.answer.section = parseSection(*section);
-  kept.answer.version = storebag.version;
+  takeSection(whole.value(), *environment, kept.answer);
+  if (kept.answer.kind != StorebagAnswer::Kind::fetched) return kept;
   kept.answer.maxAge = stored.value()->maxAge;
   kept.answer.lastModified = std::move(stored.value()->lastModified);
   kept.fetchTime = stored.value()->fetchTime;

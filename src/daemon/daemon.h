@@ -17,7 +17,8 @@
 
 namespace veltrad::daemon {
 
-// The objects between the services and the listener. The services outlive it; it outlives the listener.
+// The objects between the services and the listener. The services outlive it; it outlives the listener. Its
+// 13 fields are these objects, in the order in which they need each other.
 class Daemon {
  public:
   explicit Daemon(Services& services);

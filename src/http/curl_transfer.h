@@ -16,7 +16,7 @@
 namespace veltrad::http {
 
 // Constructed on the caller's thread, then used only on the HTTP thread. `connections` must exist while an
-// easy handle is attached. Its 24 fields are the request, what libcurl is given, and the answer as it
+// easy handle is attached. Its 23 fields are the request, what libcurl is given, and the answer as it
 // arrives.
 class CurlTransfer {
  public:
