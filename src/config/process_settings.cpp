@@ -94,7 +94,7 @@ std::optional<std::string> ProcessSettings::storebagServerURL() {
 std::optional<std::string> ProcessSettings::computeStorebagServerURL() {
   const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
   if (!preference) return std::nullopt;
-  if (const auto url = preference.value() ? preference.value()->toText() : std::nullopt) return url;
+  if (auto url = preference.value() ? preference.value()->toText() : std::nullopt) return url;
   const std::optional<bool> internal = _device.internalBuild();
   const auto host = internal ? storebagHost(*internal) : std::nullopt;
   if (!host) return std::nullopt;
