@@ -48,7 +48,11 @@ class StorebagDownload {
                                             const std::optional<std::string>& lastModified);
 
  private:
-  enum class Refusal { notGenuine, keyOutOfReach };
+  struct Refusal {
+    StorebagCause cause;  // noAttempt: the key is out of reach just now
+    std::string why;
+    std::optional<bool> genuine;  // as in StorebagAnswer
+  };
 
   WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
                                     const http::HTTPError& error) const;

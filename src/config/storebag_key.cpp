@@ -2,6 +2,7 @@
 // thread.
 #include "config/storebag_key.h"
 
+#include <fmt/format.h>
 #include <openssl/bn.h>
 #include <openssl/core_names.h>
 #include <openssl/decoder.h>
@@ -9,6 +10,7 @@
 #include <openssl/evp.h>
 #include <openssl/provider.h>
 #include <openssl/rsa.h>
+#include <openssl/x509.h>
 
 namespace veltrad::config {
 namespace {
@@ -26,6 +28,10 @@ using Key = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
 using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
 using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
 using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
+
+struct OpenSSLFree {
+  void operator()(unsigned char* bytes) const { OPENSSL_free(bytes); }
+};
 
 const unsigned char* bytesOf(std::string_view text) {
   return reinterpret_cast<const unsigned char*>(text.data());
@@ -98,6 +104,22 @@ bool StorebagKey::verifies(std::string_view bag, std::string_view signature) con
                                  nullptr) == 1 &&
          EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1 &&
          EVP_DigestVerify(context.get(), bytesOf(signature), signature.size(), bytesOf(bag), bag.size()) == 1;
+}
+
+std::string StorebagKey::fingerprint() const {
+  const ErrorQueueAsItWas errors;
+  unsigned char* der = nullptr;
+  const int size = i2d_PUBKEY(_held->key.get(), &der);
+  const std::unique_ptr<unsigned char, OpenSSLFree> held(der);
+  unsigned char digest[EVP_MAX_MD_SIZE];
+  std::size_t length = 0;
+  std::string text;
+  if (size <= 0 || EVP_Q_digest(_held->library.get(), "SHA256", nullptr, der, static_cast<std::size_t>(size),
+                                digest, &length) != 1) {
+    return text;
+  }
+  for (std::size_t i = 0; i < length; ++i) text += fmt::format("{:02x}", digest[i]);
+  return text;
 }
 
 int StorebagKey::modulusBits() const {

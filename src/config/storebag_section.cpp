@@ -40,7 +40,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return {};
+    StorebagSectionAnswer none;
+    none.cause = StorebagCause::noName;
+    none.why = "client type " + std::to_string(clientType) + " has no storebag";
+    return none;
   }
   const WholeStorebagAnswer whole = _download.fetchStorebagWithName(name, lastModified);
   StorebagSectionAnswer answer{whole, nullptr, {}};
@@ -52,6 +55,8 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
     answer.attempted = false;
+    answer.cause = StorebagCause::noAttempt;
+    answer.why = "the environment cannot be read just now";
     return answer;
   }
   const auto storebag = parsed<Storebag>(whole.storebag);
@@ -62,6 +67,11 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
+    if (answer.cause == StorebagCause::none) {
+      answer.cause = StorebagCause::noSection;
+      answer.why = sectionName ? "it has no section \"" + std::string(sectionName) + "\""
+                               : "environment " + std::to_string(*environment) + " names no section";
+    }
     return answer;
   }
   answer.kind = Kind::fetched;

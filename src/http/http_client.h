@@ -72,9 +72,12 @@ struct HTTPError {
     shortage,   // no descriptor, thread or memory for it just now; nothing was sent
     stopping,   // the daemon is stopping
   };
+  // Where a transport error ended the exchange.
+  enum class Cause { other, resolve, connect, trust, timeout };
   Kind kind = Kind::transport;
   std::string description;  // one line, a system text: "Could not resolve host: x"
   int status = 0;           // of an answer that then was cut; 0: none came
+  Cause cause = Cause::other;
 };
 
 // What the request keeps until its completion has run, what libcurl copies of it included; not what the

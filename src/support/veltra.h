@@ -25,6 +25,7 @@ class Veltra {
   Result<std::string, platform::FileFailure> statedVersion() const;
   // The bytes of the resource "publicKey" of type "der"; read afresh at each call.
   Result<std::string, platform::FileFailure> publicKeyDER() const;
+  const std::string& publicKeyPath() const { return _publicKeyPath; }
   // A 36-character UUID text that stays the same across restarts: one while consent is respected (true),
   // another while it is overridden (false). Made and stored on first use under "uuidRespectDNU" and
   // "uuidOverrideDNU". Nothing: for a shortage nobody can say which it is.
