@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <utility>
 
+#include "config/preference_keys.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
@@ -13,10 +14,6 @@
 
 namespace veltrad::config {
 namespace {
-
-constexpr std::uint32_t kEnvironmentCount = 5;
-constexpr std::uint32_t kInternalEnvironment = 2;
-constexpr std::uint32_t kSeedEnvironment = 3;
 
 constexpr const char* kInternalStorebagHost = "storebags.internal.example";
 constexpr const char* kPublicStorebagHost = "storebags.example";
@@ -72,7 +69,8 @@ std::optional<std::uint32_t> ProcessSettings::currentEnvironment() {
 }
 
 std::optional<ProcessSettings::Environment> ProcessSettings::userDefaultsEnvironment() {
-  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "environmentType");
+  const auto preference =
+      _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kEnvironmentType);
   if (!preference) return std::nullopt;
   const auto stored = preference.value() ? preference.value()->toUInt32() : std::nullopt;
   if (stored && *stored >= kEnvironmentCount) return Environment{kInternalEnvironment, stored};
@@ -94,7 +92,7 @@ std::optional<std::string> ProcessSettings::storebagServerURL() {
 }
 
 std::optional<std::string> ProcessSettings::computeStorebagServerURL() {
-  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
+  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kStorebagURL);
   if (!preference) return std::nullopt;
   if (const auto url = preference.value() ? preference.value()->toText() : std::nullopt) return url;
   const std::optional<bool> internal = _device.internalBuild();

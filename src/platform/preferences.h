@@ -48,6 +48,10 @@ class FilePreferences final : public Preferences {
   bool setValue(std::string_view domain, std::string_view key, const Value& value) override;
   std::optional<std::string> textOrStore(std::string_view domain, std::string_view key,
                                          std::string (*make)()) override;
+  // Stores the value, or takes the key away where there is none; other keys stay. The error is one line,
+  // which was not logged.
+  Result<Done, std::string> change(std::string_view domain, std::string_view key,
+                                   const std::optional<Value>& value);
 
  private:
   using Complaints = std::vector<std::string>;  // error lines, logged when the lock is released
@@ -60,6 +64,8 @@ class FilePreferences final : public Preferences {
                                           Complaints& complaints) REQUIRES(_mutex);
   bool store(std::string_view domain, std::string_view key, const Value& value, Complaints& complaints)
       REQUIRES(_mutex);
+  Result<Done, std::string> write(std::string_view domain, std::string_view key,
+                                  const std::optional<Value>& value, Complaints& complaints) REQUIRES(_mutex);
   std::string pathOf(std::string_view domain) const;
 
   FileStore& _files;

@@ -15,6 +15,10 @@ class Root;
 
 namespace veltrad::support {
 
+// Under which preferences the identifiers of this device are kept.
+inline constexpr const char* kIdentifierRespectingConsent = "uuidRespectDNU";
+inline constexpr const char* kIdentifierOverridingConsent = "uuidOverrideDNU";
+
 class Veltra {
  public:
   Veltra(platform::FileStore& files, platform::Preferences& preferences, const platform::Root& root);
