@@ -103,6 +103,9 @@ struct HTTPClientSettings {
   std::string extraCertificatesPath;  // PEM, trusted beside the system's; no such file: none
 };
 
+// "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
+std::string transportLibraries();
+
 // libcurl's multi interface on one thread, which starts with the first request; where it cannot, the next
 // request tries again. Never forks; SIGPIPE must be ignored.
 class CurlHTTPClient final : public HTTPClient {
