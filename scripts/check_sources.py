@@ -1,5 +1,7 @@
 """Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
 place; the exit status is 1 if there is any."""
+import concurrent.futures
+import os
 import re
 import subprocess
 import sys
@@ -60,38 +62,79 @@ def check_size():
     return found
 
 
-def configure():
-    done = subprocess.run(["cmake", "--preset", "dev"], cwd=ROOT, capture_output=True, text=True)
+def configure(preset):
+    done = subprocess.run(["cmake", "--preset", preset], cwd=ROOT, capture_output=True, text=True)
     if done.returncode != 0:
         sys.exit(done.stdout + done.stderr)
 
 
 def check_must_not_compile():
-    configure()  # creates the rooms' include directories
+    configure("dev")  # creates the rooms' include directories
     done = subprocess.run([sys.executable, "tests/must_not_compile/run.py"], cwd=ROOT, capture_output=True, text=True)
     return [] if done.returncode == 0 else done.stdout.splitlines()
 
 
-def check_lint():
-    configure()
-    files = [str(path) for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"]
-    done = subprocess.run(["run-clang-tidy", "-quiet", "-p", "build/dev", *files], cwd=ROOT, capture_output=True,
-                          text=True)
-    return [line for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
+def git(*arguments):
+    done = subprocess.run(["git", *arguments], cwd=ROOT, capture_output=True, text=True)
+    return done.stdout.split() if done.returncode == 0 else []
+
+
+def changed_files():
+    """What differs from the commit where this branch left origin/main or, on main itself and without a remote, from the
+    commit before this one. None: there is no such commit."""
+    base = git("merge-base", "HEAD", "origin/main")
+    if not base or base == git("rev-parse", "HEAD"):
+        base = git("rev-parse", "--verify", "HEAD~1")
+    if not base:
+        return None
+    return set(git("diff", "--name-only", *base) + git("ls-files", "--others", "--exclude-standard"))
+
+
+def body_for(header, bodies):
+    """A body that includes the header, its own one if there is one."""
+    includes = re.compile(rf'#include ["<](.*/)?{re.escape(header.name)}[">]')
+    for body in sorted(bodies, key=lambda path: (path.stem != header.stem, path)):
+        if includes.search(body.read_text()):
+            return body
+    return None
+
+
+def lint(body):
+    done = subprocess.run(["clang-tidy", "--quiet", "-p", "build/lint", str(body)], cwd=ROOT, capture_output=True, text=True)
+    found = [line for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
+    return found or ([] if done.returncode == 0 else [f"{body}: clang-tidy failed: {done.stderr.strip()}"])
+
+
+def check_lint(changed=None):
+    """Lints the bodies that changed and, for each header that changed, one that includes it. None: all bodies."""
+    configure("lint")
+    bodies = {path for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"}
+    if changed is not None:
+        files = {ROOT / name for name in changed if name.startswith(("src/", "include/"))}
+        headers = {path for path in files if path.suffix in (".h", ".hpp") and path.exists()}
+        bodies = bodies & (files | {body_for(path, bodies) for path in headers})
+    with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
+        return sorted({line.replace(f"{ROOT}/", "") for found in pool.map(lint, sorted(bodies)) for line in found})
 
 
 def main():
     checks = {"format": check_format, "include ladder": check_ladder, "size": check_size,
               "must not compile": check_must_not_compile, "lint": check_lint}
-    if "--no-lint" in sys.argv[1:]:
+    arguments = sys.argv[1:]
+    if arguments == ["--no-lint"]:
         del checks["lint"]
-    failed = False
+    elif arguments == ["--changed"]:
+        checks = {"lint of what changed": lambda: check_lint(changed_files())}
+    elif arguments:
+        sys.exit(f"scripts/check: unknown argument {arguments[0]}; expected --no-lint or --changed")
+    failed = 0
     for name, check in checks.items():
         found = check()
-        failed |= bool(found)
-        print(f"{name}: " + ("ok" if not found else f"{len(found)} found"))
+        failed += bool(found)
+        print(f"{name}: " + ("ok" if not found else f"{len(found)} found"), flush=True)
         for line in found:
             print("  " + line)
+    print(f"{len(checks) - failed} passed, {failed} failed")
     sys.exit(1 if failed else 0)
 
 

@@ -1,4 +1,4 @@
-"""Builds the given presets (default: dev asan tsan), runs every test program in each and prints the totals."""
+"""Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals."""
 import os
 import re
 import subprocess
@@ -81,10 +81,10 @@ def test(preset):
 
 
 def main():
-    presets = sys.argv[1:] or PRESETS
+    presets = PRESETS if sys.argv[1:] == ["all"] else sys.argv[1:] or ["dev"]
     unknown = [preset for preset in presets if preset not in PRESETS]
     if unknown:
-        sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected one of: {' '.join(PRESETS)}")
+        sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected all, or some of: {' '.join(PRESETS)}")
     passed = failed = 0
     for preset in presets:
         if build(preset):

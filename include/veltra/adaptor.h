@@ -1,10 +1,10 @@
-/* What an adaptor bundle exports to veltrad: one table, `veltra_adaptor`, with the classes of the bundle,
- * found by name, and their operations, found by selector. docs/adaptor.md says how a bundle is built and
- * where it goes; examples/adaptor.c is a whole one.
+/* The interface of an adaptor bundle: it exports one table, `veltra_adaptor`, with its classes by name and
+ * their operations by selector. See docs/adaptor.md for how to build and install a bundle, and
+ * examples/adaptor.c for a complete one.
  *
- * Threads: creations, destructions and operations of different instances may run at the same time on
- * different threads; those of one instance never do. An operation runs on the thread of the session that
- * sends: until it returns, that session's client waits. Such a thread's stack has 256 KiB.
+ * Threads: functions of different instances may run at the same time on different threads, those of one
+ * instance never do. An operation runs on the thread of the session that sends the message, which has a stack
+ * of 256 KiB; the session's client waits until it returns.
  */
 #ifndef VELTRA_ADAPTOR_H
 #define VELTRA_ADAPTOR_H
@@ -17,15 +17,14 @@
 extern "C" {
 #endif
 
-/* Of this header. The daemon uses no table of another version. */
+/* The version of this header. The daemon refuses tables of other versions. */
 #define VELTRA_ADAPTOR_VERSION 1
 
 /* The class and the operation that the daemon looks for. */
 #define VELTRA_ADAPTOR_CLASS "MivoAdaptor"
 #define VELTRA_ADAPTOR_SEND "sendMessageWithMethod:respCode:dict:"
 
-/* ---- The payload: a tree of plain values, borrowed until the operation returns, nested at most 64 deep ----
- */
+/* ---- The payload: a tree of values, at most 64 levels deep and valid until the operation returns ---- */
 
 typedef enum veltra_adaptor_type {
   VELTRA_ADAPTOR_BOOLEAN = 1,
@@ -44,13 +43,13 @@ typedef struct veltra_adaptor_entry veltra_adaptor_entry;
 
 struct veltra_adaptor_value {
   veltra_adaptor_type type;
-  size_t count; /* bytes of a string (without its NUL) or data, items, entries; else 0 */
+  size_t count; /* of bytes in a string (without its NUL) or data, of items, or of entries; else 0 */
   union {
     bool boolean;
     int64_t signed_integer;
     uint64_t unsigned_integer;
-    double real;        /* also a date: seconds since 1970 */
-    const char* string; /* UTF-8 and a NUL; may hold others */
+    double real;        /* for a date: seconds since 1970 */
+    const char* string; /* UTF-8 with a terminating NUL; may contain others */
     const void* data;
     const veltra_adaptor_value* items;   /* of an array */
     const veltra_adaptor_entry* entries; /* of a dictionary, in ascending order of the keys' bytes */
@@ -65,7 +64,7 @@ struct veltra_adaptor_entry {
 
 /* ---- The table ---- */
 
-/* `dict` is a dictionary, or NULL where the message has no payload. */
+/* `dict` is a dictionary, or NULL if the message has no payload. */
 typedef void (*veltra_adaptor_function)(void* instance, uint16_t method, uint16_t resp_code,
                                         const veltra_adaptor_value* dict);
 
@@ -76,7 +75,7 @@ typedef struct veltra_adaptor_operation {
 
 typedef struct veltra_adaptor_class {
   const char* name;
-  void* (*create)(void); /* an instance, or NULL when there can be none */
+  void* (*create)(void); /* returns an instance, or NULL on failure */
   void (*destroy)(void* instance);
   size_t operation_count;
   const veltra_adaptor_operation* operations;

@@ -1,4 +1,4 @@
-// The values of veltra.hpp, which includes this: owners of what veltra.h calls veltra_value, under its rules.
+// The values of veltra.hpp, which includes this file: owners of a veltra_value, with the rules of veltra.h.
 #ifndef VELTRA_VALUE_HPP
 #define VELTRA_VALUE_HPP
 
@@ -18,7 +18,8 @@ struct Date {
   double secondsSince1970 = 0;
 };
 struct Data {
-  std::string_view bytes;  // borrowed while the value is made
+  // Copied into the value.
+  std::string_view bytes;
 };
 
 // A reference to a value, or none. Copies share it.
@@ -47,19 +48,19 @@ class Value {
   }
   ~Value() { veltra_release(_value); }
 
-  // Takes over one reference.
+  // Takes over a reference.
   static Value adopt(veltra_value* value) {
     Value made;
     made._value = value;
     return made;
   }
-  // Adds a reference of its own.
+  // Adds a reference.
   static Value share(const veltra_value* value) { return adopt(veltra_retain(value)); }
 
   explicit operator bool() const { return _value != nullptr; }
   veltra_type type() const { return veltra_type_of(_value); }
   const veltra_value* get() const { return _value; }
-  // The caller's from now on.
+  // Hands the reference over to the caller.
   veltra_value* release() { return std::exchange(_value, nullptr); }
 
   bool boolean() const { return veltra_get_boolean(_value); }

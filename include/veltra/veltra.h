@@ -1,14 +1,14 @@
-/* libveltra: report to veltrad from C. See veltra.hpp for the same in C++20.
+/* libveltra: report to veltrad from C. See veltra.hpp for C++20.
  *
  * Threads: every function may be called from any thread; calls on one session are carried out in the order in
- * which they were made. Callbacks run on a thread of the session's own, one at a time; a waiting call inside
- * a callback is refused with VELTRA_WOULD_DEADLOCK.
+ * which they were made. Callbacks run one at a time on a thread of the session; a waiting call inside a
+ * callback is refused with VELTRA_WOULD_DEADLOCK.
  *
- * Nothing here throws, and no function but those that end in _wait, veltra_session_close and
- * veltra_session_create waits for anything.
+ * No function throws. Only the functions that end in _wait, veltra_session_close and veltra_session_create
+ * wait.
  *
- * Processes: the descriptors are closed by exec. After a fork the session belongs to the parent: the child
- * must not use it, close included, and opens one of its own. No signal handler runs on a session's thread.
+ * Processes: exec closes the descriptors. After a fork the session belongs to the parent: the child must
+ * neither use nor close it, but may open its own. No signal handler runs on a session's thread.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -25,26 +25,26 @@ extern "C" {
 
 typedef enum veltra_status {
   VELTRA_OK = 0,
-  VELTRA_NO_DAEMON = 1,      /* nobody listens on the socket, or the connection has ended */
+  VELTRA_NO_DAEMON = 1,      /* no daemon listens on the socket, or the connection has ended */
   VELTRA_REFUSED = 2,        /* the daemon refused the connection or the call */
   VELTRA_QUEUE_FULL = 3,     /* the session's queue is full; the call was dropped and counted */
-  VELTRA_INVALID = 4,        /* an argument is not what it must be; nothing was done */
+  VELTRA_INVALID = 4,        /* an argument is invalid; nothing was done */
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
   VELTRA_TOO_LARGE = 7,      /* over 1 MiB (log data 16 MiB), 100,000 keys and values, 60 levels; not sent */
 } veltra_status;
 
-/* A short English text for a status; static. */
+/* A short English text for a status, valid for ever. */
 VELTRA_API const char* veltra_status_text(veltra_status status);
-/* The library's package version, "8.0"; static. */
+/* The version of the library, "8.0", valid for ever. */
 VELTRA_API const char* veltra_version(void);
 
 /* ---- Values: booleans, integers, reals, texts (UTF-8), dates, data, arrays, dictionaries ----
  *
- * Counted references: each create returns one reference, which the caller releases, or hands over where a
- * function says that it takes it. A value that is part of another cannot be changed any more
- * (VELTRA_INVALID); containers nest at most 64 deep. Bytes of a text that are no UTF-8 become U+FFFD. NULL is
- * "no value" and every function takes it as such.
+ * Values are reference-counted: each function that makes one returns one reference, which the caller releases
+ * or passes to a function that takes it over. A value that is part of another cannot be changed
+ * (VELTRA_INVALID). Containers nest at most 64 levels deep. Bytes of a text that are not valid UTF-8 become
+ * U+FFFD. Every function accepts NULL as "no value".
  */
 typedef struct veltra_value veltra_value;
 
@@ -72,8 +72,8 @@ VELTRA_API veltra_value* veltra_data(const void* bytes, size_t length);
 VELTRA_API veltra_value* veltra_array(void);
 VELTRA_API veltra_value* veltra_dictionary(void);
 
-/* Both take over the reference to `value`, also when they fail (VELTRA_INVALID: wrong kind of container, no
- * key, no value, nested too deep). A key that is there already gets the new value. */
+/* Both take over the reference to `value`, even if they fail (VELTRA_INVALID: wrong kind of container, no
+ * key, no value, nested too deep). An existing key gets the new value. */
 VELTRA_API veltra_status veltra_array_append(veltra_value* array, veltra_value* value);
 VELTRA_API veltra_status veltra_dictionary_set(veltra_value* dictionary, const char* key,
                                                veltra_value* value);
@@ -82,17 +82,19 @@ VELTRA_API veltra_value* veltra_retain(const veltra_value* value);
 VELTRA_API void veltra_release(const veltra_value* value);
 
 VELTRA_API veltra_type veltra_type_of(const veltra_value* value);
-/* The value by its type; false, 0 or NULL for another type. The pointers live as long as the value. */
+/* The content of a value; false, 0 or NULL for any other type. The pointers are valid as long as the value.
+ * Integers of the other kind are returned if they fit, veltra_get_real also converts integers and dates, and
+ * strings have a terminating NUL. */
 VELTRA_API bool veltra_get_boolean(const veltra_value* value);
-VELTRA_API int64_t veltra_get_signed(const veltra_value* value); /* also of an unsigned one that fits */
-VELTRA_API uint64_t
-veltra_get_unsigned(const veltra_value* value);               /* also of a signed one that is not negative */
-VELTRA_API double veltra_get_real(const veltra_value* value); /* also of an integer, and of a date */
-VELTRA_API const char* veltra_get_string(const veltra_value* value, size_t* length); /* NUL-terminated too */
+VELTRA_API int64_t veltra_get_signed(const veltra_value* value);
+VELTRA_API uint64_t veltra_get_unsigned(const veltra_value* value);
+VELTRA_API double veltra_get_real(const veltra_value* value);
+VELTRA_API const char* veltra_get_string(const veltra_value* value, size_t* length);
 VELTRA_API const void* veltra_get_data(const veltra_value* value, size_t* length);
-/* Items of an array, entries of a dictionary (in ascending order of the keys' bytes); 0 for anything else. */
+/* The number of items of an array or entries of a dictionary, which are in ascending order of the keys'
+ * bytes; 0 for any other type. */
 VELTRA_API size_t veltra_count(const veltra_value* value);
-/* Borrowed, not to be released; NULL where there is none. */
+/* Not to be released; NULL if there is none. */
 VELTRA_API const veltra_value* veltra_array_item(const veltra_value* array, size_t index);
 VELTRA_API const veltra_value* veltra_dictionary_item(const veltra_value* dictionary, const char* key);
 VELTRA_API const veltra_value* veltra_dictionary_entry(const veltra_value* dictionary, size_t index,
@@ -100,20 +102,19 @@ VELTRA_API const veltra_value* veltra_dictionary_entry(const veltra_value* dicti
 
 /* ---- Replies ---- */
 
-/* What a call was answered. Given to a callback it lives until the callback returns. */
+/* The answer to a call. In a callback it is valid until the callback returns. */
 typedef struct veltra_reply veltra_reply;
 
-/* How the call ended. VELTRA_OK: the daemon answered. */
+/* How the call ended; VELTRA_OK if the daemon answered. */
 VELTRA_API veltra_status veltra_reply_status(const veltra_reply* reply);
-/* The text answered, or NULL for none; `length` may be NULL. */
+/* The text of the answer, or NULL; `length` may be NULL. */
 VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* length);
-/* The backends that report: an array of texts, or NULL when none could be had. */
+/* The back ends that report: an array of texts, or NULL if there are none. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
-/* Of an uploaded file: the server has confirmed it, and the library has removed it. */
+/* True if the server has confirmed an uploaded file and the library has removed it. */
 VELTRA_API bool veltra_reply_removed(const veltra_reply* reply);
-/* The error of the answer (of a flush, say) or of the call itself; domain and description are NULL without
- * one. */
+/* The error in the answer or of the call; domain and description are NULL if there is none. */
 VELTRA_API const char* veltra_reply_error_domain(const veltra_reply* reply);
 VELTRA_API int64_t veltra_reply_error_code(const veltra_reply* reply);
 VELTRA_API const char* veltra_reply_error_description(const veltra_reply* reply);
@@ -125,15 +126,15 @@ typedef void (*veltra_callback)(void* context, const veltra_reply* reply);
 
 typedef struct veltra_session veltra_session;
 
-/* A copy of a message of this session or of one below it, for the session that aggregates. `session_info` and
- * `payload` are borrowed and may be NULL; everything empty or zero marks the end of aggregation. */
+/* Receives a copy of a message of this session or of one below it. `session_info` and `payload` are valid
+ * until it returns, and may be NULL. If everything is empty or zero, aggregation has ended. */
 typedef void (*veltra_aggregation_callback)(void* context, const veltra_value* session_info, double timestamp,
                                             uint16_t category, uint16_t type, const veltra_value* payload);
 
 typedef struct veltra_session_options {
-  size_t size;      /* sizeof(veltra_session_options): lets the library tell old callers from new */
-  const char* root; /* directory that holds run/veltrad; NULL: VELTRA_ROOT, else "/" */
-  /* Session info. A has_… that is false leaves its key out. */
+  size_t size;      /* sizeof(veltra_session_options), which identifies the version of the struct */
+  const char* root; /* the directory that contains run/veltrad; NULL: VELTRA_ROOT, else "/" */
+  /* Session info. A key is left out if its has_… is false. */
   bool has_client_type;
   int32_t client_type; /* 0 to 17 */
   bool has_session_id;
@@ -142,56 +143,54 @@ typedef struct veltra_session_options {
   uint16_t client_version;
   bool require_user_info;
   bool batch_events;
-  /* User info: the dictionary given, with the two names added where they are not NULL. All three NULL: no
-   * user info. Borrowed for the call. */
+  /* User info: the dictionary, with the two names added. There is none if all three are NULL. */
   const veltra_value* user_info;
   const char* client_name;
   const char* service_name;
-  /* Not NULL: this session aggregates. */
+  /* If not NULL, this session aggregates. */
   veltra_aggregation_callback aggregated;
   void* aggregated_context;
-  /* Bytes of calls that may wait to be written, 1 MiB where 0. A call beyond it is dropped; one that has the
-   * queue for itself may be larger. */
+  /* Bytes of calls that may wait to be written; 0 means 1 MiB. Further calls are dropped. A single waiting
+   * call may be larger. */
   size_t queue_bytes;
-  /* Says nothing of the session on connecting: for one-shot messages, which say it themselves. */
+  /* Does not describe the session on connecting: for one-shot messages, which contain a description. */
   bool undescribed;
 } veltra_session_options;
 
 /* Fills in the defaults and `size`. */
 VELTRA_API void veltra_session_options_init(veltra_session_options* options);
 
-/* Connects and describes the session (unless undescribed). NULL on failure; then `*error`, when `error` is
- * not NULL, is a text that says what is wrong and what to do, to be freed with veltra_free, and `*status`,
- * when not NULL, the status. */
+/* Connects to the daemon and describes the session. NULL on failure; then `*error` is a text that says what
+ * is wrong and what to do, to be freed with veltra_free, and `*status` is the status. Both pointers may be
+ * NULL. */
 VELTRA_API veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
                                                  char** error);
 VELTRA_API void veltra_free(char* text);
 
-/* Without _wait: VELTRA_OK means that the call is on its way and `callback` (when not NULL) will run exactly
- * once; anything else means that nothing was sent and the callback will not run. With _wait: waits for the
- * answer; `*reply` (when `reply` is not NULL) is set in every case and is to be released; the result is the
- * reply's status. */
+/* Without _wait: VELTRA_OK means that the call was accepted and `callback` (unless NULL) will run exactly
+ * once; otherwise nothing was sent and the callback will not run. With _wait: waits for the answer and
+ * returns its status;
+ * `*reply` (unless `reply` is NULL) is always set and must be released. */
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
 
-/* `payload` is a dictionary or NULL, borrowed. flag: 1 and 3 realtime, 2 and 3 override sampling, 0 neither.
- */
+/* `payload` is a dictionary or NULL. flag: 1 and 3 are realtime, 2 and 3 override sampling, 0 is neither. */
 VELTRA_API veltra_status veltra_session_send(veltra_session*, uint16_t category, uint16_t type,
                                              const veltra_value* payload, uint32_t flag, veltra_callback,
                                              void* context);
 VELTRA_API veltra_status veltra_session_send_wait(veltra_session*, uint16_t category, uint16_t type,
                                                   const veltra_value* payload, uint32_t flag,
                                                   veltra_reply** reply);
-/* A message dictionary as it is: "category", "type", "payload", "flag"; the daemon checks it. */
+/* Sends a dictionary with "category", "type", "payload" and "flag" unchanged; the daemon checks it. */
 VELTRA_API veltra_status veltra_session_send_dictionary(veltra_session*, const veltra_value* message,
                                                         veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_send_dictionary_wait(veltra_session*, const veltra_value* message,
                                                              veltra_reply** reply);
 
-/* One message with all that the daemon must know about its sender, who need not have started: `who` as for
- * veltra_session_create (its user info and names, all up to batch_events; client type and session ID are
- * needed, or there is no answer). The reply's text is "finished", whatever became of the message, or
- * "storebag not available". The session is `who` from then on. */
+/* Sends one message with a description of its sender; the session need not be started. Of `who`, the session
+ * info and the user info are used; client type and session ID are required, or there is no answer. The text
+ * of the reply is "finished", whether or not the message was reported, or "storebag not available".
+ * Afterwards the session has the description `who`. */
 VELTRA_API veltra_status veltra_session_send_one_shot(veltra_session*, const veltra_session_options* who,
                                                       uint16_t category, uint16_t type,
                                                       const veltra_value* payload, veltra_callback,
@@ -202,23 +201,20 @@ VELTRA_API veltra_status veltra_session_send_one_shot_wait(veltra_session*, cons
 
 VELTRA_API veltra_status veltra_session_flush(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_flush_wait(veltra_session*, veltra_reply** reply);
-/* Uploads a regular file of at most 2,147,483,647 bytes. The library opens it, without waiting for it and
- * without following a link, and lends it to the daemon, which has no other way to it; it is named by the last
- * component of `path`. Of a file that others serve (FUSE, a network) it lends a copy, which it makes before
- * the call goes, however long that takes. The answer comes when the servers have answered.
- * veltra_reply_uploaded: a request was carried out. Where the server has confirmed it, the library removes
- * the file, if its path still names the same one (veltra_reply_removed): it renames it to a hidden name
- * beside it first, so that no other file is removed that somebody puts there. A file that has changed
- * meanwhile stays. The answer's error is the library's: why nobody takes such a file, or why one that was
- * stored could not be removed. */
+/* Uploads a regular file of at most 2,147,483,647 bytes. The library opens it, without following a link, and
+ * lends it to the daemon; the server gets the last component of `path` as its name. Of a file on a FUSE or
+ * network file system the library lends a copy, and this function returns only when the copy is made. The
+ * answer arrives after those of the servers. veltra_reply_uploaded: a request was carried out.
+ * veltra_reply_removed: the server has confirmed the file, and the library has removed it. It does so only if
+ * the path still names the same file, which it first renames to a hidden name in the same directory so that
+ * no other file can be removed by mistake. A file that was changed stays. The error of the answer says why
+ * the file was not taken, or why a file that was stored was not removed. */
 VELTRA_API veltra_status veltra_session_upload_file(veltra_session*, const char* path, veltra_callback,
                                                     void* context);
 VELTRA_API veltra_status veltra_session_upload_file_wait(veltra_session*, const char* path,
                                                          veltra_reply** reply);
-/* `data` is an array, borrowed, of at most 16 MiB and 100,000 keys and values. The answer, which comes when
- * the servers have answered, says with veltra_reply_uploaded whether anybody took it; it has no error of its
- * own.
- */
+/* `data` is an array of at most 16 MiB and 100,000 keys and values. The answer arrives after those of the
+ * servers; veltra_reply_uploaded says whether any of them accepted the data. It has no error. */
 VELTRA_API veltra_status veltra_session_upload_log_data(veltra_session*, const veltra_value* data,
                                                         veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_upload_log_data_wait(veltra_session*, const veltra_value* data,
@@ -234,20 +230,19 @@ VELTRA_API veltra_status veltra_session_finish(veltra_session*, veltra_callback,
 VELTRA_API veltra_status veltra_session_finish_wait(veltra_session*, veltra_reply** reply);
 
 typedef struct veltra_statistics {
-  uint64_t sent;       /* calls handed to the daemon */
-  uint64_t dropped;    /* calls refused, or given up in the queue, because it was full or nobody listened */
-  uint64_t queued;     /* calls that wait to be written, now */
-  uint64_t replies;    /* answers received */
-  uint64_t unanswered; /* calls that ended without an answer */
-  uint64_t
-      dropped_events; /* aggregated copies lost because their callbacks did not keep up (4,096 may wait) */
+  uint64_t sent;           /* calls written to the daemon */
+  uint64_t dropped;        /* calls lost because the queue was full or the connection had ended */
+  uint64_t queued;         /* calls that now wait to be written */
+  uint64_t replies;        /* answers received */
+  uint64_t unanswered;     /* calls that ended without an answer */
+  uint64_t dropped_events; /* aggregated copies lost because more than 4,096 waited for the callback */
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
 
-/* Writes out what waits, for at most 2 s, closes the connection, ends calls without an answer with
- * VELTRA_NO_REPLY (their callbacks run before this returns), frees the session. Returns how many calls were
- * lost unwritten. Inside a callback it does nothing and returns 0. No call may start any more once this has
- * been called; waiting calls that are under way end. NULL does nothing. */
+/* Writes the waiting calls for at most 2 s, closes the connection, ends open calls with VELTRA_NO_REPLY
+ * (their callbacks run before this returns) and frees the session. Returns the number of calls that were not
+ * written. Inside a callback, or with NULL, it does nothing and returns 0. No other call on the session may
+ * start after this one; waiting calls end. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus

@@ -1,5 +1,5 @@
-// libveltra in C++20, header-only: what veltra.h offers, with owners for its handles. Nothing throws; the
-// rules on threads, callbacks and processes are those of veltra.h.
+// libveltra for C++20: a header-only interface to veltra.h with owners for its handles. Nothing throws; the
+// rules of veltra.h on threads, callbacks and processes apply.
 //
 //   veltra::Session session{{.clientType = 7, .sessionID = 42, .clientName = "phone"}};
 //   if (!session) std::cerr << session.error().description << '\n';
@@ -35,34 +35,36 @@ struct Error {
   std::string description;
 };
 
-// A value, or why there is none.
+// A value or an error.
 template <typename T>
 class Result {
  public:
   Result(T value) : _side(std::in_place_index<0>, std::move(value)) {}
   Result(Error error) : _side(std::in_place_index<1>, std::move(error)) {}
   explicit operator bool() const { return _side.index() == 0; }
-  // Only where there is one.
+  // Only if there is a value.
   const T& operator*() const { return *std::get_if<0>(&_side); }
   const T* operator->() const { return std::get_if<0>(&_side); }
-  // Empty where there is a value.
+  // Empty if there is a value.
   Error error() const { return *this ? Error{} : *std::get_if<1>(&_side); }
 
  private:
   std::variant<T, Error> _side;
 };
 
-// The backends that report; absent when none could be had.
+// The back ends that report; absent if there are none.
 using Backends = std::optional<std::vector<std::string>>;
 
-// What a call was answered.
+// The answer to a call.
 struct Reply {
   Status status = VELTRA_OK;
   std::optional<std::string> text;
   Backends backends;
   bool uploaded = false;
-  bool removed = false;        // of an uploaded file
-  std::optional<Error> error;  // of the answer, or of the call where the status is not VELTRA_OK
+  // An uploaded file was confirmed and removed.
+  bool removed = false;
+  // In the answer or, if the status is not VELTRA_OK, of the call.
+  std::optional<Error> error;
 
   explicit operator bool() const { return status == VELTRA_OK; }
 
@@ -98,33 +100,40 @@ using Callback = std::function<void(const Reply&)>;
 
 // ---- Sessions ----
 
-// A copy of a message of this session or of one below it. Everything empty or zero: the end of aggregation.
+// A copy of a message of this session or of one below it. If everything is empty or zero, aggregation has
+// ended.
 struct Aggregated {
   Value sessionInfo;
-  double timestamp = 0;  // seconds since 1970
+  // In seconds since 1970.
+  double timestamp = 0;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   Value payload;
 };
 
-// What is absent is not said to the daemon.
+// Absent values are left out of the description of the session.
 struct Options {
-  std::optional<std::int32_t> clientType = {};  // 0 to 17
+  // 0 to 17.
+  std::optional<std::int32_t> clientType = {};
   std::optional<std::uint32_t> sessionID = {};
   std::optional<std::uint16_t> clientVersion = {};
   std::optional<std::string> clientName = {};
   std::optional<std::string> serviceName = {};
-  Value userInfo = {};  // a dictionary; the two names are added to it
+  // A dictionary, to which the two names are added.
+  Value userInfo = {};
   bool requireUserInfo = false;
   bool batchEvents = false;
-  std::function<void(const Aggregated&)> aggregated = {};  // given: this session aggregates
-  std::optional<std::string> root = {};                    // absent: VELTRA_ROOT, else "/"
-  std::size_t queueBytes = 0;                              // 1 MiB where 0
-  bool undescribed = false;                                // says nothing of itself: for one-shot messages
+  // If not empty, this session aggregates.
+  std::function<void(const Aggregated&)> aggregated = {};
+  // If absent: VELTRA_ROOT, else "/".
+  std::optional<std::string> root = {};
+  // 0 means 1 MiB.
+  std::size_t queueBytes = 0;
+  // Does not describe the session on connecting: for one-shot messages.
+  bool undescribed = false;
 };
 
-// A session from its making to its end. One that could not be made is false, says why, and refuses every
-// call.
+// A session. If it could not be made, it is false, error() says why, and it refuses every call.
 class Session {
  public:
   explicit Session(const Options& options = {}) : _aggregated(sharedHandler(options.aggregated)) {
@@ -143,13 +152,10 @@ class Session {
       : _aggregated(std::move(other._aggregated)),
         _session(std::exchange(other._session, nullptr)),
         _error(std::move(other._error)) {}
-  Session& operator=(Session&& other) noexcept {
-    if (this != &other) {
-      close();
-      _aggregated = std::move(other._aggregated);
-      _session = std::exchange(other._session, nullptr);
-      _error = std::move(other._error);
-    }
+  Session& operator=(Session other) noexcept {
+    std::swap(_aggregated, other._aggregated);
+    std::swap(_session, other._session);
+    std::swap(_error, other._error);
     return *this;
   }
   ~Session() { close(); }
@@ -157,7 +163,7 @@ class Session {
   explicit operator bool() const { return _session != nullptr; }
   const Error& error() const { return _error; }
 
-  // These wait for the daemon.
+  // These functions wait for the daemon.
   Result<Backends> start() { return backends(wait(&veltra_session_start_wait)); }
   Result<Backends> states(const Value& userInfo = {}) {
     return backends(wait(&veltra_session_states_wait, userInfo.get()));
@@ -174,7 +180,7 @@ class Session {
     return wait(&veltra_session_send_wait, category, type, payload.get(), flag);
   }
 
-  // These do not wait. flag: 1 and 3 realtime, 2 and 3 override sampling.
+  // These do not wait. flag: 1 and 3 are realtime, 2 and 3 override sampling.
   std::future<Reply> send(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
                           std::uint32_t flag = 0) {
     return promised(
@@ -184,18 +190,19 @@ class Session {
               std::uint32_t flag = 0) {
     return call(std::move(callback), &veltra_session_send, category, type, payload.get(), flag);
   }
-  // Asks for no answer: the cheapest.
+  // The fastest way: asks for no answer.
   Status post(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
               std::uint32_t flag = 0) {
     return veltra_session_send(_session, category, type, payload.get(), flag, nullptr, nullptr);
   }
-  // "category", "type", "payload", "flag" as they stand; the daemon checks them.
+  // Sends "category", "type", "payload" and "flag" unchanged; the daemon checks them.
   std::future<Reply> send(const Dictionary& message) {
     return promised([&](Callback callback) {
       return call(std::move(callback), &veltra_session_send_dictionary, message.get());
     });
   }
-  // Without a start; of `who` what stands before `aggregated`. "finished", or "storebag not available".
+  // The session need not be started. Of `who`, the fields before `aggregated` are used. The text of the reply
+  // is "finished" or "storebag not available".
   std::future<Reply> sendOneShot(const Options& who, std::uint16_t category, std::uint16_t type,
                                  const Dictionary& payload = {}) {
     return promised([&](Callback callback) {
@@ -203,14 +210,15 @@ class Session {
       return call(std::move(callback), &veltra_session_send_one_shot, &plain, category, type, payload.get());
     });
   }
-  // Takes as long as the servers do. A file that the server has confirmed is `removed`, unless `error` says
-  // why not; one that is not `uploaded` stays, and `error` says why where the library sees it.
+  // The answer arrives after those of the servers. A file that the server has confirmed is `removed`, unless
+  // `error` says why not. One that is not `uploaded` stays; `error` may say why.
   std::future<Reply> uploadFile(const std::string& path) {
     return promised([&](Callback callback) {
       return call(std::move(callback), &veltra_session_upload_file, path.c_str());
     });
   }
-  // `data` is an array. Takes as long as the servers do; the reply's `uploaded` says whether anybody took it.
+  // `data` is an array. The answer arrives after those of the servers; `uploaded` says whether any accepted
+  // it.
   std::future<Reply> uploadLogData(const Value& data) {
     return promised([&](Callback callback) {
       return call(std::move(callback), &veltra_session_upload_log_data, data.get());
@@ -229,7 +237,8 @@ class Session {
     veltra_session_statistics(_session, &counts);
     return counts;
   }
-  // Returns how many calls were lost unwritten. The destructor does the same. Not inside a callback.
+  // Returns the number of calls that were not written. The destructor calls it. Not to be called in a
+  // callback.
   std::uint64_t close() { return veltra_session_close(std::exchange(_session, nullptr)); }
 
  private:
@@ -238,7 +247,7 @@ class Session {
   static const char* text(const std::optional<std::string>& given) {
     return given ? given->c_str() : nullptr;
   }
-  // Borrows the texts.
+  // Refers to the texts of `options`.
   static veltra_session_options identityOf(const Options& options) {
     veltra_session_options plain;
     veltra_session_options_init(&plain);
@@ -282,7 +291,7 @@ class Session {
     if (!callback) return function(_session, arguments..., nullptr, nullptr);
     auto kept = std::make_unique<Callback>(std::move(callback));
     const Status status = function(_session, arguments..., &onReply, kept.get());
-    if (status == VELTRA_OK) (void)kept.release();  // onReply's
+    if (status == VELTRA_OK) (void)kept.release();  // owned by onReply
     return status;
   }
   template <typename Call>

@@ -5,8 +5,10 @@
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/https/https_post_backend.h"
 #include "backends/mivo/mivo_backend.h"
+#include "backends/sampling_factors.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
+#include "platform/random.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
@@ -14,6 +16,16 @@ namespace veltrad::backends {
 namespace {
 // Devices of this product type have no adaptor.
 constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+
+// The one draw that a back end takes, decided before.
+class FixedDraw final : public platform::Random {
+ public:
+  explicit FixedDraw(double draw) : _draw(draw) {}
+  double uniform() override { return _draw; }
+
+ private:
+  const double _draw;
+};
 }  // namespace
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
@@ -28,19 +40,23 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
                                                     const std::optional<std::string>& productFamily,
                                                     const SessionFacts& facts, bool oneShot) {
   const std::string family = productFamily.value_or("");
+  const auto stable =
+      _services.sampling ? _services.sampling->stableFactor(facts.compType, name) : std::nullopt;
+  FixedDraw fixed(stable.value_or(0));
+  platform::Random& random = stable ? fixed : _services.random;
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName({_services.random, _services.clock, _services.counters,
-                                           _services.pool, _logData, _dashboards, facts.account, oneShot},
+    return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
+                                           _logData, _dashboards, facts.account, oneShot},
                                           name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendUploadServer) {
-    return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
-                                        _services.counters, _services.scratchDirectory},
-                                       name, std::get_if<config::UploadProfile>(profile.get()), family);
+    return UploadBackend::initWithName(
+        {random, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
+        name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
     return HTTPSPostBackend::initWithName(
-        {_services.random,
+        {random,
          _services.locale,
          _services.counters,
          _posts,
@@ -48,12 +64,11 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
-                                       family);
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, random, name, family);
   }
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
-                                     family, facts.compType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
+                                     facts.compType);
   }
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;

@@ -1,4 +1,4 @@
-// Base64 both ways, by table. Any thread.
+// Base64 encoding and decoding with lookup tables.
 #include "base/base64.h"
 
 #include <array>

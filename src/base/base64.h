@@ -1,4 +1,4 @@
-// Base64 by RFC 4648, section 4, without line breaks on the way out. Any thread.
+// Base64 (RFC 4648, section 4), encoded without line breaks.
 #pragma once
 
 #include <optional>
@@ -9,9 +9,8 @@ namespace veltrad {
 
 std::string encodeBase64(std::string_view bytes);
 
-// Characters outside the alphabet (line breaks, blanks, anything else) are skipped. Nothing when what remains
-// is no base64: a lone character in the last group, padding that is missing or too long, or characters after
-// the padding.
+// Skips characters outside the alphabet, such as line breaks and blanks. Absent if the rest is not valid: a
+// single character in the last group, missing or excess padding, or characters after the padding.
 std::optional<std::string> decodeBase64(std::string_view text);
 
 }  // namespace veltrad

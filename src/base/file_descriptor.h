@@ -1,8 +1,10 @@
-// A file descriptor that is closed with its owner. A plain value; any thread.
+// A file descriptor that is closed with its owner, and writing to one.
 #pragma once
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <string_view>
 #include <utility>
 
 namespace veltrad {
@@ -29,5 +31,16 @@ class FileDescriptor {
  private:
   int _descriptor = -1;
 };
+
+// Writes all of `bytes`. Returns 0, or the errno of the call that failed.
+inline int writeAll(int descriptor, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return errno;
+    bytes.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
 
 }  // namespace veltrad

@@ -1,4 +1,4 @@
-// The run-time check of the lock order. Each thread keeps its own list.
+// The run-time check of the lock order: each thread keeps a list of the ranks that it holds.
 #include "base/mutex.h"
 
 #include <cstdio>

@@ -1,5 +1,5 @@
-// Mutexes that the compiler checks: annotated for Clang's thread safety analysis, ranked at run time in debug
-// builds. Any thread.
+// Mutexes with annotations for Clang's thread safety analysis and, in debug builds, a check of the lock
+// order.
 #pragma once
 
 #include <condition_variable>
@@ -14,26 +14,24 @@
 #define CAPABILITY(name) VELTRA_ANNOTATE(capability(name))
 #define SCOPED_CAPABILITY VELTRA_ANNOTATE(scoped_lockable)
 #define GUARDED_BY(m) VELTRA_ANNOTATE(guarded_by(m))
-#define PT_GUARDED_BY(m) VELTRA_ANNOTATE(pt_guarded_by(m))
 #define ACQUIRED_BEFORE(...) VELTRA_ANNOTATE(acquired_before(__VA_ARGS__))
 #define ACQUIRED_AFTER(...) VELTRA_ANNOTATE(acquired_after(__VA_ARGS__))
 #define REQUIRES(...) VELTRA_ANNOTATE(requires_capability(__VA_ARGS__))
 #define EXCLUDES(...) VELTRA_ANNOTATE(locks_excluded(__VA_ARGS__))
 #define ACQUIRE(...) VELTRA_ANNOTATE(acquire_capability(__VA_ARGS__))
 #define RELEASE(...) VELTRA_ANNOTATE(release_capability(__VA_ARGS__))
-#define RETURN_CAPABILITY(m) VELTRA_ANNOTATE(lock_returned(m))
 #define NO_THREAD_SAFETY_ANALYSIS VELTRA_ANNOTATE(no_thread_safety_analysis)
 
 namespace veltrad {
 
-// The place of a lock in the order: a thread takes only locks of a higher rank than the highest it holds.
-// Ranks are numbers; the room that owns a lock gives its rank a name. Leaves take nothing further, but for
-// those of a rank above theirs.
+// The place of a lock in the order: a thread may take only locks of a higher rank than any it holds. Ranks
+// are numbers; the room that owns a lock names its rank. While a leaf is held, only locks above `leaf` may be
+// taken.
 enum class LockRank : int { leaf = 100 };
 
-// The same order for the compiler: two levels stand around each multiple of ten, and a lock of that rank lies
-// between them, a leaf above them all. Clang's -Wthread-safety-beta then refuses a function that takes two
-// locks in the wrong order.
+// The same order for the compiler: a lock whose rank is a multiple of ten lies between two levels, and a leaf
+// lies above all levels. Clang's -Wthread-safety-beta then refuses a function that takes two locks in the
+// wrong order.
 namespace lock_order {
 class CAPABILITY("lock level") Level {};
 inline Level above0;
@@ -47,9 +45,14 @@ LOCK_LEVELS(40, 30);
 LOCK_LEVELS(50, 40);
 LOCK_LEVELS(60, 50);
 #undef LOCK_LEVELS
+
+// In debug builds, taking() aborts with both ranks if `rank` may not be taken now.
+void taking(LockRank rank);
+void released(LockRank rank);
 }  // namespace lock_order
 
-// Behind the name of a lock: `Mutex _mutex LOCK_OF_RANK(20);` and `Mutex _mutex LEAF_LOCK{LockRank::leaf};`.
+// To be written after the name of a lock: `Mutex _mutex LOCK_OF_RANK(20);`, `Mutex _mutex
+// LEAF_LOCK{LockRank::leaf};`.
 #define LOCK_OF_RANK(rank)                              \
   ACQUIRED_AFTER(::veltrad::lock_order::below##rank)    \
   ACQUIRED_BEFORE(::veltrad::lock_order::above##rank) { \
@@ -57,17 +60,9 @@ LOCK_LEVELS(60, 50);
   }
 #define LEAF_LOCK ACQUIRED_AFTER(::veltrad::lock_order::above60)
 
-namespace lock_order {
-// Debug builds: aborts with both ranks when `rank` may not be taken now. Release builds: nothing.
-void taking(LockRank rank);
-void released(LockRank rank);
-}  // namespace lock_order
-
 class CAPABILITY("mutex") Mutex {
  public:
   explicit Mutex(LockRank rank) : _rank(rank) {}
-  Mutex(const Mutex&) = delete;
-  Mutex& operator=(const Mutex&) = delete;
 
   void lock() ACQUIRE() {
 #ifndef NDEBUG
@@ -85,7 +80,7 @@ class CAPABILITY("mutex") Mutex {
  private:
   friend class Condition;
   std::mutex _mutex;
-  [[maybe_unused]] const LockRank _rank;  // of use in debug builds alone
+  [[maybe_unused]] const LockRank _rank;
 };
 
 class SCOPED_CAPABILITY Lock {
@@ -93,13 +88,12 @@ class SCOPED_CAPABILITY Lock {
   explicit Lock(Mutex& mutex) ACQUIRE(mutex) : _mutex(mutex) { _mutex.lock(); }
   ~Lock() RELEASE() { _mutex.unlock(); }
   Lock(const Lock&) = delete;
-  Lock& operator=(const Lock&) = delete;
 
  private:
   Mutex& _mutex;
 };
 
-// Waits for a condition under a Mutex; always in a loop around the condition, or with wait_until's predicate.
+// A condition variable for Mutex. Wake-ups may be spurious: wait in a loop that checks the condition.
 class Condition {
  public:
   void wait(Mutex& mutex) REQUIRES(mutex) {
@@ -107,7 +101,7 @@ class Condition {
     _condition.wait(held);
     held.release();
   }
-  // False when `deadline` passed first.
+  // False if `deadline` passed first.
   template <typename TimePoint>
   bool waitUntil(Mutex& mutex, TimePoint deadline) REQUIRES(mutex) {
     std::unique_lock<std::mutex> held(mutex._mutex, std::adopt_lock);

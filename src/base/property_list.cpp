@@ -1,9 +1,13 @@
-// What a reader of binary lists can be told before and after it reads.
+// The number of objects in a property list, as declared and as counted.
 #include "base/property_list.h"
 
 #include "base/property_list_binary.h"
 
 namespace veltrad {
+
+std::string PropertyListError::description() const {
+  return place ? "line " + std::to_string(place->line) + ": " + detail : detail;
+}
 
 std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
   using namespace binary_property_list;

@@ -1,4 +1,4 @@
-// The numbers of the binary property list's format, for its reader and its writer alone. Any thread.
+// The constants of the binary property list format, for its reader and its writer.
 #pragma once
 
 #include <cstddef>
@@ -15,7 +15,7 @@ inline constexpr std::uint8_t kNull = 0x00;
 inline constexpr std::uint8_t kFalse = 0x08;
 inline constexpr std::uint8_t kTrue = 0x09;
 inline constexpr std::uint8_t kDate = 0x33;
-// High halves of markers; the low half is a count or the logarithm of a size.
+// Upper halves of markers; the lower half is a count or the logarithm of a size.
 inline constexpr std::uint8_t kSimple = 0x00;
 inline constexpr std::uint8_t kInteger = 0x10;
 inline constexpr std::uint8_t kReal = 0x20;

@@ -1,4 +1,4 @@
-// Reads binary property lists that nobody vouches for. Any thread.
+// Reads binary property lists from untrusted bytes.
 //
 // Layout: "bplist00", the objects, a table of their offsets, and a trailer of 32 bytes that says where the
 // table is and how wide offsets and references are. All numbers are big-endian.
@@ -27,13 +27,13 @@ std::uint64_t bigEndian(const char* at, std::size_t size) {
   return number;
 }
 
-// Of a text that was given its length at once; a short one stands in its own object.
+// The memory of a string that was allocated with this length; a short one is stored in the object itself.
 std::size_t textBlock(std::size_t length) {
   static const std::size_t kInPlace = std::string().capacity();
   return length > kInPlace ? blockBytes(length + 1) : 0;
 }
 
-// Reads one list. On the caller's stack; the bytes outlive it.
+// Reads one list. The bytes must outlive it.
 class Reader {
  public:
   Reader(std::string_view bytes, const PropertyListLimits& limits)
@@ -58,7 +58,7 @@ class Reader {
     std::uint64_t object;
     const Path* outer;
   };
-  // An object's place: its marker, and what follows it in the object area.
+  // An object: its number, its marker, and the bytes of the object area that follow the marker.
   struct Object {
     std::uint64_t number;
     std::uint8_t marker;
@@ -116,7 +116,7 @@ class Reader {
   std::size_t _referenceSize = 0;
   std::uint64_t _count = 0;
   std::uint64_t _top = 0;
-  std::uint64_t _table = 0;  // where the object area ends and the table of offsets begins
+  std::uint64_t _table = 0;  // ends the object area
   PropertyListError _error{};
 };
 
@@ -162,7 +162,7 @@ bool Reader::chargeText(std::uint64_t bytes) {
   return true;
 }
 
-// Before the memory is taken.
+// To be called before the memory is allocated.
 inline bool Reader::chargeMemory(std::uint64_t bytes) {
   if (bytes > _memoryLeft) return fail(Kind::overMemory, "its values need more memory than the limit");
   _memoryLeft -= bytes;
@@ -180,7 +180,7 @@ inline bool Reader::locate(std::uint64_t number, Object& object) {
   return true;
 }
 
-// The count of a marker: its low half, or an integer object right behind it when that is 15.
+// The count of an object: the lower half of its marker or, if that is 15, the integer object that follows.
 inline bool Reader::takeCount(Object& object, std::uint64_t& count) {
   count = object.marker & 0xFu;
   if (count != 0xF) return true;
@@ -334,7 +334,7 @@ bool Reader::enter(const Object& object, const Path* path, int depth) {
 bool Reader::readArray(Object& object, const Path* path, int depth, Value& value) {
   std::uint64_t count = 0;
   std::string_view references;
-  // The children are paid for before room is made for them.
+  // The elements are charged before they are allocated.
   if (!enter(object, path, depth) || !takeCount(object, count) ||
       !take(object, count, _referenceSize, references) || !charge(count) ||
       !chargeMemory(sharedBytes<Array>() + blockBytes(count * sizeof(Value)))) {

@@ -1,5 +1,4 @@
-// Writes binary property lists: one walk that measures, one that writes into room of exactly that size. Any
-// thread.
+// Writes binary property lists in two passes: one measures, one writes into a buffer of exactly that size.
 #include <bit>
 #include <cstring>
 
@@ -20,7 +19,7 @@ std::size_t widthOf(std::uint64_t number) {
   return width;
 }
 
-// Integers are 1, 2, 4 or 8 bytes; the marker holds the logarithm.
+// Integers have 1, 2, 4 or 8 bytes; the marker holds the logarithm.
 unsigned exponentOf(std::uint64_t number) {
   return number < 0x100 ? 0u : number < 0x10000 ? 1u : number < 0x100000000 ? 2u : 3u;
 }
@@ -34,7 +33,8 @@ std::size_t integerSize(std::uint64_t number, bool isSigned) {
   return 1 + (std::size_t{1} << exponentOf(number));
 }
 
-// What a value takes: its objects, the references between them, and the bytes of all objects but references.
+// The size of a value: its objects, the references between them, and the bytes of all objects without
+// references.
 struct Measure {
   std::uint64_t objects = 0;
   std::uint64_t references = 0;
@@ -98,7 +98,7 @@ void Measure::add(const Value& value) {
 }
 
 void putBigEndian(char*& at, std::uint64_t number, std::size_t size) {
-  if (size == 1) {  // nearly every reference
+  if (size == 1) {  // the most frequent case
     *at++ = static_cast<char>(number);
     return;
   }
@@ -109,7 +109,7 @@ void putBigEndian(char*& at, std::uint64_t number, std::size_t size) {
   at += size;
 }
 
-// The widths and places that follow from a measure.
+// The widths and offsets that follow from a measure.
 struct Layout {
   explicit Layout(const Measure& measure) : referenceSize(widthOf(measure.objects - 1)) {
     table = kHeader.size() + measure.bytes + measure.references * referenceSize;
@@ -118,11 +118,12 @@ struct Layout {
   }
   std::size_t referenceSize;
   std::size_t offsetSize;
-  std::uint64_t table;  // where the offsets begin
+  // Where the table of offsets begins.
+  std::uint64_t table;
   std::uint64_t size;
 };
 
-// Writes into room of the layout's size. An object's number is the order in which it is begun.
+// Writes into a buffer of the layout's size. Objects are numbered in the order in which they are begun.
 class Writer {
  public:
   Writer(char* start, const Layout& layout)
@@ -208,7 +209,7 @@ void Writer::put(const Value& value) {
     case Value::Type::dictionary:
       return putDictionary(*value.asDictionary());
     case Value::Type::string:
-      return;  // above
+      return;  // handled above
   }
 }
 

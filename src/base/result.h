@@ -1,4 +1,4 @@
-// Result<T, E>: a value, or the reason why there is none. No thread rule: a plain value.
+// Result<T, E>: a value, or an error that says why there is none.
 #pragma once
 
 #include <cstdlib>
@@ -7,7 +7,7 @@
 
 namespace veltrad {
 
-// Marks the error side when a Result is made: `return Failure{Error::tooDeep};`
+// Makes a Result that holds an error: `return Failure{Error::tooDeep};`
 template <typename E>
 struct Failure {
   E error;
@@ -15,11 +15,10 @@ struct Failure {
 template <typename E>
 Failure(E) -> Failure<E>;
 
-// The value of a Result that has nothing to give but that all went well.
+// The value of a Result whose operation returns nothing.
 struct Done {};
 
-// Asking for the side that is not there is a broken invariant and aborts. A refusal is handled by its direct
-// caller; it is not passed on unread.
+// Access to the side that it does not hold aborts.
 template <typename T, typename E>
 class [[nodiscard]] Result {
  public:

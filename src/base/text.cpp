@@ -1,4 +1,4 @@
-// UTF-8 by RFC 3629, simple lower case by utf8proc, log lines. Any thread.
+// UTF-8 (RFC 3629), lower case, percent-encoding, hexadecimal digits and log lines.
 #include "base/text.h"
 
 #include <utf8proc.h>
@@ -20,7 +20,7 @@ bool isContinuation(std::uint8_t byte) {
   return (byte & 0xC0) == 0x80;
 }
 
-// Length of a sequence that begins with this byte; 0 when none does.
+// Length of the sequence that begins with this byte; 0 if none does.
 std::size_t sequenceLength(std::uint8_t first) {
   if (first < 0x80) return 1;
   if (first >= 0xC2 && first <= 0xDF) return 2;
@@ -29,8 +29,8 @@ std::size_t sequenceLength(std::uint8_t first) {
   return 0;
 }
 
-// The second byte of a sequence of three or four is what shuts out overlong forms, surrogates and values too
-// high.
+// In sequences of three or four bytes, the second one excludes overlong forms, surrogates and values above
+// U+10FFFF.
 bool isSecond(std::uint8_t first, std::uint8_t second) {
   switch (first) {
     case 0xE0:
@@ -117,7 +117,6 @@ std::string lowerCase(std::string_view text) {
       continue;
     }
     appendUTF8(out, static_cast<char32_t>(utf8proc_tolower(static_cast<utf8proc_int32_t>(character.code))));
-
     i += character.length;
   }
   return out;
@@ -129,6 +128,25 @@ bool equalIgnoringCase(std::string_view a, std::string_view b) {
 
 bool containsIgnoringCase(std::string_view text, std::string_view part) {
   return lowerCase(text).find(lowerCase(part)) != std::string::npos;
+}
+
+TextPlace placeInText(std::string_view text, std::size_t offset) {
+  TextPlace place;
+  for (const char c : text.substr(0, offset)) {
+    if (c == '\n') {
+      ++place.line;
+      place.column = 1;
+    } else if ((static_cast<unsigned char>(c) & 0xc0) != 0x80) {  // no continuation byte
+      ++place.column;
+    }
+  }
+  return place;
+}
+
+std::string_view trimmed(std::string_view text, std::string_view blanks) {
+  const std::size_t first = text.find_first_not_of(blanks);
+  if (first == std::string_view::npos) return {};
+  return text.substr(first, text.find_last_not_of(blanks) - first + 1);
 }
 
 std::string percentEncoded(std::string_view text, std::string_view kept) {
@@ -157,7 +175,7 @@ std::string hex(std::string_view bytes, const char* digits) {
 
 std::string escapedForLog(std::string_view text) {
   const auto plain = [](char c) { return c >= 0x20 && c < 0x7F && c != '\\'; };
-  if (std::all_of(text.begin(), text.end(), plain)) return std::string(text);  // nearly always
+  if (std::all_of(text.begin(), text.end(), plain)) return std::string(text);  // the most frequent case
   std::string out;
   out.reserve(text.size());
   for (std::size_t i = 0; i < text.size();) {

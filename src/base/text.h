@@ -1,4 +1,4 @@
-// UTF-8, letter case and the escaping of log lines. Pure functions; any thread.
+// Functions on texts: UTF-8, letter case, trimming and escaping.
 #pragma once
 
 #include <cstddef>
@@ -9,7 +9,7 @@
 
 namespace veltrad {
 
-// Eight bytes at a time; the last word overlaps the one before it.
+// Reads eight bytes at a time; the last word overlaps the one before it.
 inline bool isASCII(std::string_view bytes) {
   constexpr std::uint64_t kHighBits = 0x8080808080808080u;
   const std::size_t size = bytes.size();
@@ -29,35 +29,47 @@ inline bool isASCII(std::string_view bytes) {
 }
 
 struct UTF8Character {
-  std::size_t length;  // in bytes; 0: the byte begins no valid sequence
+  // In bytes; 0 if no valid sequence begins here.
+  std::size_t length;
   char32_t code;
 };
-// `i` is below the size.
+// `i` must be less than the size.
 UTF8Character characterAt(std::string_view bytes, std::size_t i);
 // `code` is a Unicode scalar value.
 void appendUTF8(std::string& text, char32_t code);
 
-// RFC 3629: no surrogates, no overlong forms, nothing above U+10FFFF.
 bool isUTF8(std::string_view bytes);
-// Each byte that belongs to no valid sequence becomes U+FFFD.
+// Replaces each byte that belongs to no valid sequence by U+FFFD.
 std::string toUTF8(std::string_view bytes);
-// Loses an incomplete sequence at the end, nothing else.
+// Removes an incomplete sequence at the end.
 std::string_view withoutIncompleteEnd(std::string_view text);
 
-// Unicode's simple lower-case mapping, character by character. Bytes that are no UTF-8 stay as they are.
+// Unicode's simple lower-case mapping of each character. Bytes that are not valid UTF-8 are kept.
 std::string lowerCase(std::string_view text);
 bool equalIgnoringCase(std::string_view a, std::string_view b);
 bool containsIgnoringCase(std::string_view text, std::string_view part);
 
-// Keeps letters, digits, "-._~" and what `kept` holds, all ASCII; each other byte becomes "%" and two digits.
+// Both from 1; the column counts characters.
+struct TextPlace {
+  std::size_t line = 1;
+  std::size_t column = 1;
+};
+// Of the byte at `offset`; of the end for one beyond it. Lines end at "\n".
+TextPlace placeInText(std::string_view text, std::size_t offset);
+
+// Without the characters of `blanks` at either end.
+std::string_view trimmed(std::string_view text, std::string_view blanks = " \t\r\n");
+
+// Keeps ASCII letters and digits, "-._~" and the characters of `kept`; every other byte becomes "%" and two
+// digits.
 std::string percentEncoded(std::string_view text, std::string_view kept);
 
 inline constexpr const char* kUpperCaseDigits = "0123456789ABCDEF";
-// Two hexadecimal digits a byte: "0a3f".
+// Two hexadecimal digits for each byte: "0a3f".
 std::string hex(std::string_view bytes, const char* digits = "0123456789abcdef");
 
-// For one log line: valid UTF-8 stays; controls, DEL, C1 controls, U+2028, U+2029 and bytes that are no UTF-8
-// become \xNN for each byte; a backslash is doubled.
+// Escapes a text for one log line: control characters (C0, DEL, C1), U+2028, U+2029 and bytes that are not
+// valid UTF-8 become \xNN, byte by byte, and a backslash is doubled.
 std::string escapedForLog(std::string_view text);
 
 }  // namespace veltrad

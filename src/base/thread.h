@@ -1,4 +1,4 @@
-// A joinable thread with a stack of a chosen size. Owned by one thread at a time.
+// A joinable thread with a stack of a given size. The object is used by one thread at a time.
 #pragma once
 
 #include <pthread.h>
@@ -11,11 +11,12 @@ class Thread {
  public:
   Thread() = default;
   Thread(Thread&& other) noexcept;
-  Thread& operator=(Thread&& other) noexcept;  // the one replaced must have been joined
+  // The thread that is replaced must have been joined.
+  Thread& operator=(Thread&& other) noexcept;
   ~Thread() { join(); }
 
-  // Runs `body` on a new thread, all signals blocked there. False when the system gives none; `body` is then
-  // gone. `name` as debuggers and `ps` show it, 15 characters at most.
+  // Runs `body` on a new thread in which all signals are blocked. False if the system cannot start one;
+  // `body` is then destroyed. `name` is shown by debuggers and `ps`; at most 15 characters.
   bool start(const char* name, std::size_t stackBytes, std::function<void()> body);
   void join();
   bool running() const { return _running; }
@@ -25,8 +26,8 @@ class Thread {
   bool _running = false;
 };
 
-// The stack of a connection's thread: room for property lists 64 levels deep and for what a call does; only
-// the pages that were touched cost memory. Sanitizers make frames several times larger.
+// The stack of a connection's thread, large enough for property lists 64 levels deep. Only pages that were
+// touched take memory. Sanitizers need frames several times larger.
 extern const std::size_t kConnectionStackBytes;
 
 }  // namespace veltrad

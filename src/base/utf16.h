@@ -1,4 +1,4 @@
-// UTF-16 as big-endian bytes, to and from UTF-8, character by character and without a copy. Any thread.
+// Conversion between big-endian UTF-16 and UTF-8, character by character and without a copy.
 #pragma once
 
 #include <cstddef>
@@ -9,8 +9,8 @@
 
 namespace veltrad {
 
-// Calls `take(char32_t)` with every character of a UTF-16 text; a lone surrogate is U+FFFD, an odd byte at
-// the end is not looked at.
+// Calls `take(char32_t)` for every character of a UTF-16 text. A lone surrogate becomes U+FFFD; an odd byte
+// at the end is ignored.
 template <typename Take>
 void forEachUTF16Character(std::string_view bytes, Take take) {
   const auto byte = [&](std::size_t i) { return char32_t{static_cast<std::uint8_t>(bytes[i])}; };
@@ -40,7 +40,7 @@ inline std::size_t utf8LengthOfUTF16(std::string_view bytes) {
   return length;
 }
 
-// Calls `take(char16_t)` with every UTF-16 unit of a UTF-8 text; bytes that are no UTF-8 are U+FFFD.
+// Calls `take(char16_t)` for every UTF-16 unit of a UTF-8 text. An invalid byte becomes U+FFFD.
 template <typename Take>
 void forEachUTF16Unit(std::string_view text, Take take) {
   for (std::size_t i = 0; i < text.size();) {

@@ -1,4 +1,4 @@
-// The value type's conversions and the dictionary's order. Any thread.
+// Conversions of values, and dictionaries as sorted vectors.
 #include "base/value.h"
 
 #include <fmt/format.h>
@@ -12,23 +12,8 @@ Value::Value(Data data) : _held(std::make_shared<const Data>(std::move(data))) {
 Value::Value(Array array) : _held(std::make_shared<Array>(std::move(array))) {}
 Value::Value(Dictionary dictionary) : _held(std::make_shared<Dictionary>(std::move(dictionary))) {}
 
-const Data* Value::asData() const {
-  const auto* held = std::get_if<std::shared_ptr<const Data>>(&_held);
-  return held ? held->get() : nullptr;
-}
-
-const Array* Value::asArray() const {
-  const auto* held = std::get_if<std::shared_ptr<const Array>>(&_held);
-  return held ? held->get() : nullptr;
-}
-
-const Dictionary* Value::asDictionary() const {
-  const auto* held = std::get_if<std::shared_ptr<const Dictionary>>(&_held);
-  return held ? held->get() : nullptr;
-}
-
 namespace {
-// What nobody else holds may be moved out: it was made as an object that may change.
+// Moves the content out if nobody shares it. The cast is allowed: the object was not made const.
 template <typename T>
 std::optional<T> takenFrom(std::shared_ptr<const T>* held) {
   if (!held) return std::nullopt;
@@ -50,21 +35,8 @@ bool Value::isNumber() const {
 }
 
 std::optional<bool> Value::toBoolean() const {
-  switch (type()) {
-    case Type::boolean:
-      return std::get<bool>(_held);
-    case Type::signedInteger:
-      return std::get<std::int64_t>(_held) != 0;
-    case Type::unsignedInteger:
-      return std::get<std::uint64_t>(_held) != 0;
-    case Type::real: {
-      const double number = std::get<double>(_held);
-      if (!std::isfinite(number)) return std::nullopt;
-      return number != 0;
-    }
-    default:
-      return std::nullopt;
-  }
+  const auto number = toDouble();
+  return number ? std::optional(*number != 0) : std::nullopt;
 }
 
 std::optional<std::int64_t> Value::toInt64() const {
@@ -77,7 +49,7 @@ std::optional<std::int64_t> Value::toInt64() const {
       return static_cast<std::int64_t>(std::get<std::uint64_t>(_held));
     case Type::real: {
       const double number = std::get<double>(_held);
-      // 64 bits of either sign: [-2^63, 2^64).
+      // 64 bits, signed or unsigned: [-2^63, 2^64).
       if (!(number >= -0x1p63 && number < 0x1p64)) return std::nullopt;
       if (number < 0x1p63) return static_cast<std::int64_t>(number);
       return static_cast<std::int64_t>(static_cast<std::uint64_t>(number));
@@ -85,24 +57,6 @@ std::optional<std::int64_t> Value::toInt64() const {
     default:
       return std::nullopt;
   }
-}
-
-std::optional<std::int32_t> Value::toInt32() const {
-  const auto wide = toInt64();
-  if (!wide) return std::nullopt;
-  return static_cast<std::int32_t>(static_cast<std::uint32_t>(static_cast<std::uint64_t>(*wide)));
-}
-
-std::optional<std::uint32_t> Value::toUInt32() const {
-  const auto wide = toInt64();
-  if (!wide) return std::nullopt;
-  return static_cast<std::uint32_t>(static_cast<std::uint64_t>(*wide));
-}
-
-std::optional<std::uint16_t> Value::toUInt16() const {
-  const auto wide = toInt64();
-  if (!wide) return std::nullopt;
-  return static_cast<std::uint16_t>(static_cast<std::uint64_t>(*wide));
 }
 
 std::optional<double> Value::toDouble() const {
@@ -132,7 +86,7 @@ std::optional<std::string> Value::toText() const {
     case Type::unsignedInteger:
       return fmt::format("{}", std::get<std::uint64_t>(_held));
     case Type::real: {
-      // fmt marks a whole real with ".0"; a decimal text has no need of it.
+      // fmt appends ".0" to a whole number.
       std::string text = fmt::format("{}", std::get<double>(_held));
       if (text.ends_with(".0")) text.resize(text.size() - 2);
       return text;
@@ -210,13 +164,6 @@ void Dictionary::set(std::string key, Value value) {
   }
 }
 
-bool Dictionary::erase(std::string_view key) {
-  const auto at = place(key);
-  if (at == _entries.end() || at->first != key) return false;
-  _entries.erase(at);
-  return true;
-}
-
 std::optional<Value> Dictionary::take(std::string_view key) {
   const auto at = place(key);
   if (at == _entries.end() || at->first != key) return std::nullopt;
@@ -238,48 +185,8 @@ void Dictionary::merge(const Dictionary& other) {
   _entries = std::move(both);
 }
 
-const std::string* Dictionary::string(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->asString() : nullptr;
-}
-
-const Dictionary* Dictionary::dictionary(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->asDictionary() : nullptr;
-}
-
-const Array* Dictionary::array(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->asArray() : nullptr;
-}
-
-std::optional<bool> Dictionary::boolean(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->toBoolean() : std::nullopt;
-}
-
-std::optional<std::int32_t> Dictionary::int32(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->toInt32() : std::nullopt;
-}
-
-std::optional<std::uint32_t> Dictionary::uint32(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->toUInt32() : std::nullopt;
-}
-
-std::optional<std::uint16_t> Dictionary::uint16(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->toUInt16() : std::nullopt;
-}
-
-std::optional<double> Dictionary::real(std::string_view key) const {
-  const Value* value = find(key);
-  return value ? value->toDouble() : std::nullopt;
-}
-
 std::size_t keptBytes(const std::string& text) {
-  // A short text stands in its own object.
+  // A short text is stored in the object itself.
   static const std::size_t kInPlace = std::string().capacity();
   return text.capacity() > kInPlace ? blockBytes(text.capacity() + 1) : 0;
 }

@@ -1,5 +1,4 @@
-// Value: what a property list holds, the one value type of the system. Immutable and shared: copies are
-// cheap, a change makes a new value. Any thread.
+// Value: the content of a property list. Immutable and shared: copies are cheap, a change makes a new value.
 #pragma once
 
 #include <cstdint>
@@ -19,8 +18,8 @@ class Value;
 
 using Array = std::vector<Value>;
 
-// Seconds since 1970-01-01 00:00:00 UTC, with fraction. (Property lists count from 2001; the codecs convert.)
 struct Date {
+  // Since 1970-01-01 00:00:00 UTC. (Property lists count from 2001; their readers and writers convert.)
   double secondsSince1970 = 0;
   bool operator==(const Date&) const = default;
 };
@@ -53,42 +52,52 @@ class Value {
 
   Type type() const { return static_cast<Type>(_held.index()); }
 
-  // Exactly this type, else null. The pointer lives as long as this value.
+  // The content, or null for any other type. The pointer is valid as long as this value.
   const std::string* asString() const { return std::get_if<std::string>(&_held); }
   const std::int64_t* asSigned() const { return std::get_if<std::int64_t>(&_held); }
   const std::uint64_t* asUnsigned() const { return std::get_if<std::uint64_t>(&_held); }
   const double* asReal() const { return std::get_if<double>(&_held); }
   const Date* asDate() const { return std::get_if<Date>(&_held); }
-  const Data* asData() const;
-  const Array* asArray() const;
-  const Dictionary* asDictionary() const;
+  const Data* asData() const { return shared<Data>(); }
+  const Array* asArray() const { return shared<Array>(); }
+  const Dictionary* asDictionary() const { return shared<Dictionary>(); }
 
-  // The content, moved out where nobody shares it, else copied; absent for another type.
+  // The content, moved out if nobody shares it, else copied; absent for any other type.
   std::optional<Dictionary> takeDictionary() &&;
   std::optional<Array> takeArray() &&;
 
   bool isBoolean() const { return type() == Type::boolean; }
-  // An integer of either sign, or a real; a boolean is not a number here.
+  // An integer or a real, not a boolean.
   bool isNumber() const;
 
-  // The rule for numbers and booleans in dictionaries from clients and storebags: a boolean read as a number
-  // is 1 or 0, a number read as a boolean is true unless 0; integers wrap to the width asked for; reals
-  // truncate; NaN, infinity and reals beyond 64 bits are absent; a text is never a number.
+  // Conversions of numbers and booleans: a boolean is 1 or 0 as a number, a number other than 0 is true as a
+  // boolean, integers wrap to the requested width, and reals are truncated. Absent for NaN, infinity, reals
+  // outside 64 bits, and any other type.
   std::optional<bool> toBoolean() const;
   std::optional<std::int64_t> toInt64() const;
-  std::optional<std::int32_t> toInt32() const;
-  std::optional<std::uint32_t> toUInt32() const;
-  std::optional<std::uint16_t> toUInt16() const;
-  // A boolean or integer as a real; NaN and infinity are absent.
+  std::optional<std::int32_t> toInt32() const { return wrapped<std::int32_t>(); }
+  std::optional<std::uint32_t> toUInt32() const { return wrapped<std::uint32_t>(); }
+  std::optional<std::uint16_t> toUInt16() const { return wrapped<std::uint16_t>(); }
+  // Absent for NaN, infinity and any other type.
   std::optional<double> toDouble() const;
-  // A string as it is; a number or boolean as its decimal text (booleans "1" and "0"); anything else absent.
+  // A string, or the decimal text of a number or boolean ("1" or "0"); absent for any other type.
   std::optional<std::string> toText() const;
 
-  // Exact: 1, 1u and 1.0 differ in type but integers of equal value are equal. Arrays and dictionaries by
-  // content.
+  // Values of different types differ, except that integers are compared by value.
   bool operator==(const Value& other) const;
 
  private:
+  template <typename T>
+  const T* shared() const {
+    const auto* held = std::get_if<std::shared_ptr<const T>>(&_held);
+    return held ? held->get() : nullptr;
+  }
+  template <typename Integer>
+  std::optional<Integer> wrapped() const {
+    const auto wide = toInt64();
+    return wide ? std::optional(static_cast<Integer>(*wide)) : std::nullopt;
+  }
+
   friend class Dictionary;
   // In the order of Type.
   std::variant<bool, std::int64_t, std::uint64_t, double, std::string, Date, std::shared_ptr<const Data>,
@@ -96,7 +105,7 @@ class Value {
       _held;
 };
 
-// Keys are unique and ordered by their bytes, ascending: this is the enumeration order of every dictionary.
+// Keys are unique and are enumerated in ascending order of their bytes.
 class Dictionary {
  public:
   using Entry = std::pair<std::string, Value>;
@@ -104,23 +113,22 @@ class Dictionary {
 
   Dictionary() = default;
   Dictionary(std::initializer_list<Entry> entries);
-  // Any order, linear-logarithmic; of equal keys the last one counts.
+  // Entries in any order; of equal keys the last one counts.
   static Dictionary fromEntries(std::vector<Entry> entries);
 
   const Value* find(std::string_view key) const;
   bool contains(std::string_view key) const { return find(key) != nullptr; }
-  // Adds or replaces. Linear in the entries after the key; for many entries use fromEntries.
+  // Adds or replaces. Linear in the number of entries after the key; use fromEntries for many entries.
   void set(std::string key, Value value);
-  // Sets the key when there is a value, does nothing otherwise.
   template <typename T>
   void setIfPresent(std::string key, const std::optional<T>& value) {
     if (value) set(std::move(key), Value(*value));
   }
-  // True when the key was there.
-  bool erase(std::string_view key);
-  // Its value, which is then no longer there.
+  // True if the key was present.
+  bool erase(std::string_view key) { return take(key).has_value(); }
+  // Removes the key and returns its value.
   std::optional<Value> take(std::string_view key);
-  // Adds every entry of `other`, replacing entries of the same key. Linear in both.
+  // Adds or replaces every entry of `other`, in linear time.
   void merge(const Dictionary& other);
 
   std::size_t size() const { return _entries.size(); }
@@ -129,35 +137,40 @@ class Dictionary {
   const_iterator begin() const { return _entries.begin(); }
   const_iterator end() const { return _entries.end(); }
 
-  // Of the key's value when it has the type, by Value's rules; else absent or null.
-  const std::string* string(std::string_view key) const;
-  const Dictionary* dictionary(std::string_view key) const;
-  const Array* array(std::string_view key) const;
-  std::optional<bool> boolean(std::string_view key) const;
-  std::optional<std::int32_t> int32(std::string_view key) const;
-  std::optional<std::uint32_t> uint32(std::string_view key) const;
-  std::optional<std::uint16_t> uint16(std::string_view key) const;
-  std::optional<double> real(std::string_view key) const;
+  // The key's value as this type, by the rules of Value; else absent or null.
+  const std::string* string(std::string_view key) const { return read(key, &Value::asString); }
+  const Dictionary* dictionary(std::string_view key) const { return read(key, &Value::asDictionary); }
+  const Array* array(std::string_view key) const { return read(key, &Value::asArray); }
+  std::optional<bool> boolean(std::string_view key) const { return read(key, &Value::toBoolean); }
+  std::optional<std::int32_t> int32(std::string_view key) const { return read(key, &Value::toInt32); }
+  std::optional<std::uint32_t> uint32(std::string_view key) const { return read(key, &Value::toUInt32); }
+  std::optional<std::uint16_t> uint16(std::string_view key) const { return read(key, &Value::toUInt16); }
+  std::optional<double> real(std::string_view key) const { return read(key, &Value::toDouble); }
 
   bool operator==(const Dictionary& other) const { return _entries == other._entries; }
 
  private:
+  template <typename Result>
+  Result read(std::string_view key, Result (Value::*as)() const) const {
+    const Value* value = find(key);
+    return value ? (value->*as)() : Result();
+  }
   std::vector<Entry>::iterator place(std::string_view key);
   std::vector<Entry> _entries;
 };
 
-// What malloc gives away for a block of that many bytes; 0 for none.
+// What malloc uses for a block of this many bytes; 0 for none.
 constexpr std::size_t blockBytes(std::size_t bytes) {
   return bytes == 0 ? 0 : bytes <= 24 ? 32 : (bytes + 8 + 15) / 16 * 16;
 }
-// Of an object made by make_shared, with its two counts.
+// What make_shared allocates: the object and its two counts.
 template <typename T>
 constexpr std::size_t sharedBytes() {
   return blockBytes(sizeof(T) + 2 * sizeof(void*));
 }
+// The memory that a text, value or container keeps besides its own object. What it shares with others counts
+// in full.
 std::size_t keptBytes(const std::string& text);
-// The memory that a value or dictionary keeps beside its own object. What it shares with others counts in
-// full. Linear in what it holds.
 std::size_t keptBytes(const Value& value);
 std::size_t keptBytes(const Dictionary& dictionary);
 std::size_t keptBytes(const Array& array);

@@ -1,4 +1,4 @@
-// The one file that is compiled again when the version changes.
+// The only file that is compiled again when the version changes.
 #include "base/version.h"
 
 namespace veltrad {

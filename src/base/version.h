@@ -1,4 +1,4 @@
-// The version of all programs and of the library: that of the project, "8.0". Any thread.
+// The version of all programs and of the library, "8.0".
 #pragma once
 
 namespace veltrad {

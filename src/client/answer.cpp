@@ -1,4 +1,4 @@
-// Reading replies, and the C interface's functions on them. Any thread.
+// Reads replies, and implements the C interface's functions on them.
 #include "client/answer.h"
 
 #include "base/property_list.h"
@@ -106,25 +106,17 @@ void veltra_reply_release(veltra_reply* reply) {
 }
 
 const char* veltra_status_text(veltra_status status) {
-  switch (status) {
-    case VELTRA_OK:
-      return "Done.";
-    case VELTRA_NO_DAEMON:
-      return "No daemon listens, or the connection to it has ended.";
-    case VELTRA_REFUSED:
-      return "The daemon refused.";
-    case VELTRA_QUEUE_FULL:
-      return "The session's queue is full; the call was dropped.";
-    case VELTRA_INVALID:
-      return "An argument is not what it must be; nothing was done.";
-    case VELTRA_NO_REPLY:
-      return "The call ended without an answer.";
-    case VELTRA_WOULD_DEADLOCK:
-      return "A waiting call inside a callback would wait for itself.";
-    case VELTRA_TOO_LARGE:
-      return "The call is larger than a frame may be; nothing was sent.";
-  }
-  return "Unknown status.";
+  static constexpr const char* kTexts[] = {"Done.",
+                                           "No daemon listens, or the connection to it has ended.",
+                                           "The daemon refused.",
+                                           "The session's queue is full; the call was dropped.",
+                                           "An argument is not what it must be; nothing was done.",
+                                           "The call ended without an answer.",
+                                           "A waiting call inside a callback would wait for itself.",
+                                           "The call is larger than a frame may be; nothing was sent."};
+  static_assert(std::size(kTexts) == VELTRA_TOO_LARGE + 1);
+  const auto place = static_cast<std::size_t>(status);
+  return place < std::size(kTexts) ? kTexts[place] : "Unknown status.";
 }
 
 const char* veltra_version(void) {

@@ -1,4 +1,4 @@
-// The answer to a call, as the C interface's veltra_reply holds it. A value with one owner; any thread.
+// The answer to a call, which is the C interface's veltra_reply.
 #pragma once
 
 #include <cstdint>
@@ -20,19 +20,20 @@ struct veltra_reply {
   bool uploaded = false;
   bool removed = false;
   std::optional<veltrad::wire::ReportingError> error;
-  std::shared_ptr<veltrad::client::UploadedFile> file;  // of an upload that is not settled
+  // Of an upload that is not settled.
+  std::shared_ptr<veltrad::client::UploadedFile> file;
 };
 
 namespace veltrad::client {
 
 using Answer = std::unique_ptr<veltra_reply>;
 
-// The body of a reply frame. One that cannot be read ends its call with VELTRA_NO_REPLY and says so.
+// From the body of a reply frame. The status is VELTRA_NO_REPLY if it cannot be read.
 Answer answerOfReply(std::string_view body);
-// A call that ended without the daemon's word; the description is the status's own text unless one is given.
+// For a call that ended without a reply. The description is the status's text unless one is given.
 Answer answerOfStatus(veltra_status status, const char* description = nullptr);
-// What an upload's answer means for its file: removes it where the daemon has asked for that, and says why it
-// stays or was not taken. For any other answer nothing.
+// Removes the file of an upload if the daemon has asked for that. The answer's error says why the file was
+// not removed or not taken. Does nothing for other answers.
 void settleUpload(veltra_reply& answer);
 
 }  // namespace veltrad::client

@@ -1,4 +1,4 @@
-// Calls from their making to their answers. Under the connection's lock.
+// Calls that are waiting for their answers.
 #include "client/call_table.h"
 
 #include <algorithm>

@@ -1,5 +1,4 @@
-// The calls of one session that are under way, and what has come for its callbacks. Under its connection's
-// lock.
+// The open calls of one session, and what has arrived for its callbacks. Used under its connection's lock.
 #pragma once
 
 #include <cstdint>
@@ -15,7 +14,7 @@
 
 namespace veltrad::client {
 
-// Events that may wait for a slow event handler; the next is dropped and counted.
+// The number of events that may wait for the event handler. More are dropped and counted.
 inline constexpr std::size_t kMostWaitingEvents = 4096;
 
 // A thread that waits for one answer.
@@ -24,19 +23,21 @@ struct Waiter {
   Answer answer;
 };
 
-// Job: ends each call exactly once: its answer goes to the thread that waits for it, else into the queue of
-// what the connection's thread is to run. Events join that queue.
+// Ends each call exactly once: the answer goes to the thread that waits for it, else into the queue of
+// callbacks that the connection's thread runs. Events go into the same queue.
 class CallTable {
  public:
   struct Call {
-    Waiter* waiter = nullptr;  // or else a callback
+    // Null if no thread waits; then there may be a callback.
+    Waiter* waiter = nullptr;
     veltra_callback callback = nullptr;
     void* context = nullptr;
-    std::shared_ptr<UploadedFile> file;  // of an upload
+    // Of an upload.
+    std::shared_ptr<UploadedFile> file;
 
     bool awaitsAnswer() const { return waiter || callback || file; }
   };
-  // An event when there is no answer.
+  // An event if there is no answer.
   struct Ready {
     veltra_callback callback = nullptr;
     void* context = nullptr;
@@ -44,33 +45,33 @@ class CallTable {
     Dictionary event;
   };
 
-  // Never 0, nor that of a call under way.
+  // Neither 0 nor the ID of an open call.
   std::uint32_t freeID() const;
   void add(std::uint32_t callID, Call call);
-  // Of a call that is not under way: dropped.
+  // Ignored if the call is not open.
   void answer(std::uint32_t callID, Answer answer);
-  // Whoever takes the call's answer removes what it has lent.
+  // The file that was lent for the call is removed once the call has its answer.
   void askForRemoval(std::uint32_t callID);
   void addEvent(Dictionary event);
   // Ends all calls without an answer, the oldest first.
   void endAll(const char* why);
 
   bool anyReady() const { return !_ready.empty(); }
-  // `batch` is empty.
+  // `batch` must be empty.
   void takeReady(std::deque<Ready>& batch);
-  // How many calls are under way that no thread waits for.
+  // The number of open calls that no thread waits for.
   std::size_t unwaited() const { return _unwaited; }
-  // Replies, calls without an answer and dropped events.
+  // Replies, calls that ended without an answer, and dropped events; the other fields are 0.
   const veltra_statistics& counts() const { return _counts; }
 
  private:
   void finish(const Call& call, Answer answer);
 
   std::unordered_map<std::uint32_t, Call> _calls;
-  std::size_t _unwaited = 0;  // of _calls
+  std::size_t _unwaited = 0;
   std::uint32_t _lastID = 0;
   std::deque<Ready> _ready;
-  std::size_t _readyEvents = 0;  // of _ready
+  std::size_t _readyEvents = 0;
   veltra_statistics _counts{};
 };
 

@@ -1,4 +1,4 @@
-// Argument dictionaries of the calls. Any thread.
+// Makes the argument dictionaries and frames of calls.
 #include "client/calls.h"
 
 #include "base/property_list.h"
@@ -18,20 +18,16 @@ namespace {
 
 using Entries = std::vector<Dictionary::Entry>;
 
-// What the daemon reads at most, less the frame's own dictionaries around it.
+// The daemon's limit, less the levels of the frame's own dictionaries.
 constexpr int kDeepestArgument = wire::kMostFrameDepth - 4;
 
 bool absentOrDictionary(const veltra_value* value) {
   return !value || value->entries();
 }
 
-// Before it is made: a value that cannot fit is not even copied.
+// False for a value that is too large for a call, which is then not even copied.
 bool fits(const veltra_value* value) {
   return !value || (value->depth <= kDeepestArgument && value->objects <= wire::kMostCallObjects);
-}
-
-std::string mended(const char* text) {
-  return toUTF8(text);
 }
 
 Value sessionInfo(const veltra_session_options& options) {
@@ -46,14 +42,14 @@ Value sessionInfo(const veltra_session_options& options) {
   return info;
 }
 
-// Session info, and user info where there is any.
+// The arguments for session info and, if there is any, user info.
 Entries identity(const veltra_session_options& options) {
   Entries arguments;
   arguments.emplace_back(key::kSessionInfo, sessionInfo(options));
   if (options.user_info || options.client_name || options.service_name) {
     Dictionary userInfo = dictionaryOfNode(options.user_info);
-    if (options.client_name) userInfo.set(wire::kVeltraUserInfoClientName, mended(options.client_name));
-    if (options.service_name) userInfo.set(wire::kVeltraUserInfoServiceName, mended(options.service_name));
+    if (options.client_name) userInfo.set(wire::kVeltraUserInfoClientName, toUTF8(options.client_name));
+    if (options.service_name) userInfo.set(wire::kVeltraUserInfoServiceName, toUTF8(options.service_name));
     arguments.emplace_back(key::kUserInfo, std::move(userInfo));
   }
   return arguments;
@@ -68,14 +64,14 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
   Dictionary whole = Dictionary::fromEntries(std::move(body));
   std::string frame = wire::makeFrame(kind, 0, whole, descriptors);
   if (!wire::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
-  // An object takes a byte at least where it stands, so that only a long frame is worth a count.
+  // Every object takes at least one byte, so only a long frame needs to be counted.
   if (frame.size() > wire::kMostCallObjects && objectsIn(Value(std::move(whole))) > wire::kMostCallObjects) {
     return {VELTRA_TOO_LARGE, {}};
   }
   return {VELTRA_OK, std::move(frame)};
 }
 
-// A call whose one argument is a dictionary; left out where it is null.
+// A call whose only argument is a dictionary, which is left out if it is null.
 CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary) {
   if (!absentOrDictionary(dictionary)) return {VELTRA_INVALID, {}};
   if (!fits(dictionary)) return {VELTRA_TOO_LARGE, {}};

@@ -1,4 +1,4 @@
-// The calls of a session as frames, ready for the wire but for their call id. Pure functions; any thread.
+// Makes the frames of a session's calls, without their call IDs.
 #pragma once
 
 #include <cstdint>
@@ -14,18 +14,19 @@
 
 namespace veltrad::client {
 
-// The upload whose file the daemon's event asks to remove; nothing for other events.
+// The ID of the upload whose file the event asks to remove; absent for other events.
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event);
 
 struct CallFrame {
-  veltra_status status;                          // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE
-  std::string frame;                             // empty unless VELTRA_OK
-  std::shared_ptr<UploadedFile> file = nullptr;  // of an upload
+  // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE; the frame is empty unless it is VELTRA_OK.
+  veltra_status status;
+  std::string frame;
+  // Of an upload.
+  std::shared_ptr<UploadedFile> file = nullptr;
 };
 
 CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});
-// `payload` is a dictionary or null. Without a flag the call has no room for one; with one it goes as a
-// dictionary.
+// `payload` is a dictionary or null. A message with a flag is sent as a message dictionary.
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag);
 CallFrame messageDictionaryFrame(const veltra_value* message);
@@ -35,9 +36,9 @@ CallFrame sessionInfoFrame(const veltra_session_options& options);
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload);
 
-// `path` is not null. Without the file's descriptor where it cannot be opened: the daemon then says why.
+// If the file cannot be opened, the frame announces no descriptor.
 CallFrame uploadFileFrame(const char* path);
-// `data` is an array; the one call whose frame may be a large one.
+// `data` is an array. This is the only large call.
 CallFrame logDataFrame(const veltra_value* data);
 
 }  // namespace veltrad::client

@@ -1,4 +1,4 @@
-// Calls out, answers and events in. See the header for who reads.
+// Sends calls, receives answers and events, and runs callbacks.
 #include "client/daemon_connection.h"
 
 #include <fmt/format.h>
@@ -21,7 +21,7 @@ namespace {
 
 constexpr std::chrono::seconds kClosingTimeout{2};
 constexpr std::size_t kReadBytes = 16u << 10;
-// Room for a caller's callbacks; only what they touch costs memory.
+// Large enough for the callbacks; only pages that were touched take memory.
 constexpr std::size_t kStackBytes = 4u << 20;
 constexpr std::uint32_t kHangUps = EPOLLRDHUP | EPOLLHUP | EPOLLERR;
 constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
@@ -73,7 +73,7 @@ DaemonConnection::~DaemonConnection() {
   if (_thread.running()) close();
 }
 
-// ---- Calls out ----
+// ---- Calls ----
 
 veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context, File file) {
   Lock lock(_lock);
@@ -110,14 +110,14 @@ veltra_status DaemonConnection::enqueue(std::string frame, CallTable::Call call)
   return VELTRA_OK;
 }
 
-// Where the daemon has gone, answers that came before are still to be read; the end of the connection follows
+// If the daemon has ended, answers that it sent before are still read; the end of the connection follows
 // them.
 void DaemonConnection::writeWaiting() {
   _out.writeWaiting(_socket.get());
   updateInterest();
 }
 
-// ---- Answers in ----
+// ---- Answers ----
 
 void DaemonConnection::waitForSocket(short events, int milliseconds) {
   pollfd watched{_socket.get(), events, 0};
@@ -159,11 +159,11 @@ void DaemonConnection::readAsWaiter(const Waiter& waiter) {
   _reader = Reader::waiter;
   updateInterest();
   while (!waiter.answer) {
-    // With calls still to be written, this one's may be among them, and the thread may be inside a callback.
+    // This call may still wait to be written, while the connection's thread is inside a callback.
     const bool writing = !_out.empty();
     _lock.unlock();
     if (writing) waitForSocket(POLLIN | POLLOUT);
-    // To block in recv() costs one system call less than poll().
+    // Blocking in recv() saves the call of poll().
     const Received received = receive(writing ? MSG_DONTWAIT : 0);
     _lock.lock();
     deliver();
@@ -238,7 +238,7 @@ std::uint64_t DaemonConnection::close() {
       writeWaiting();
     }
     end();
-    ::shutdown(_socket.get(), SHUT_RDWR);  // a thread that reads comes back
+    ::shutdown(_socket.get(), SHUT_RDWR);  // makes a thread that reads return
     _stopping = true;
     wake();
   }
@@ -288,12 +288,12 @@ void DaemonConnection::serve(std::uint32_t events) {
   if (events & EPOLLOUT) writeWaiting();
   if (events & kHangUps) {
     _hungUp = true;
-    unwatch();  // or it would be reported without end while a waiting thread reads
+    unwatch();  // or epoll would report it again and again while a waiting thread reads
   }
   if (((events & EPOLLIN) || _hungUp) && _reader == Reader::nobody && !_ended) readAsOwnThread();
 }
 
-// False when the thread is to end.
+// False if the thread is to end.
 bool DaemonConnection::runReady() {
   std::deque<CallTable::Ready> batch;
   {
@@ -320,7 +320,7 @@ void DaemonConnection::unwatch() {
   if (std::exchange(_watched, false)) ::epoll_ctl(_epoll.get(), EPOLL_CTL_DEL, _socket.get(), nullptr);
 }
 
-// With nothing to be read but answers that a waiting thread fetches itself, the thread sleeps on.
+// The connection's thread is not woken for answers that a waiting thread reads itself.
 void DaemonConnection::updateInterest() {
   if (!_watched) return;
   std::uint32_t wanted = EPOLLRDHUP;

@@ -1,5 +1,4 @@
-// The client's end of a connection: calls out, answers and events in. Any thread; callbacks on its own
-// thread.
+// The client's end of a connection to the daemon. Any thread may make calls; callbacks run on its own thread.
 #pragma once
 
 #include <atomic>
@@ -23,51 +22,48 @@
 
 namespace veltrad::client {
 
-// Job: carries calls to the daemon in the order in which they were made and ends each exactly once.
+// Sends calls to the daemon in the order in which they were made, and ends each exactly once.
 //
-// Whoever holds the reading role reads the socket, alone: a thread that waits for its own answer takes the
-// role when it is free, which makes such a call as fast as a bare exchange on the socket; otherwise the
-// connection's thread does. Both hand each answer to the thread that waits for it, or into the queue of
-// callbacks, which the connection's thread alone runs, under no lock.
+// One thread at a time reads the socket. A thread that waits for its own answer becomes the reader if there
+// is none, which makes such a call as fast as an exchange on the bare socket; otherwise the connection's
+// thread reads. The reader passes each answer to the thread that waits for it, or into the queue of
+// callbacks. Only the connection's thread runs callbacks, without holding a lock.
 //
-// Its 18 fields are the descriptors that its thread sleeps on and what epoll knows of them, who reads and
-// what that has brought, the frames out and the calls under way: who reads and what is watched follow from
-// what waits, so that all of it changes under one lock.
+// Its 18 fields are the descriptors that its thread waits for and their state in epoll, the reader and what
+// it has read, the frames to be written and the open calls. They depend on each other, so one lock guards
+// them all.
 //
-// close() ends it; no other call may start after that. Threads that wait hold a share of it, since they leave
-// after their answer is there.
+// After close() no other call may start. Waiting threads share the ownership, because they may still use the
+// object after their answer has arrived.
 class DaemonConnection {
  public:
   // Gets an event's body on the connection's thread.
   using EventHandler = std::function<void(const Dictionary&)>;
 
-  // Null when the system gives no descriptors or no thread; `error` says which. Without a handler events that
-  // are not about an upload are dropped.
+  // Null if there are no descriptors or no thread; `error` says which. Without a handler, all events but
+  // those about uploads are dropped.
   static std::shared_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
                                                 EventHandler handler, std::string& error);
   ~DaemonConnection();
-  DaemonConnection(const DaemonConnection&) = delete;
-  DaemonConnection& operator=(const DaemonConnection&) = delete;
 
   using File = std::shared_ptr<UploadedFile>;
 
-  // `frame` is a call's, its call id still 0. Without a callback no answer is asked for, unless there is a
-  // file that the answer is about.
+  // `frame` is a call with the call ID 0. Without a callback and a file, no answer is asked for.
   veltra_status send(std::string frame, veltra_callback callback, void* context, File file = nullptr);
-  // The answer is still to be settled (settleUpload), on the caller's thread.
+  // The caller must settle the answer (settleUpload).
   Answer sendAndWait(std::string frame, File file = nullptr);
   bool onOwnThread() const {
     return _ownThread.load(std::memory_order_relaxed) == std::this_thread::get_id();
   }
   veltra_statistics statistics();
-  // See veltra_session_close. Returns how many calls were accepted but never written.
+  // See veltra_session_close. Returns the number of calls that were accepted but never written.
   std::uint64_t close();
 
  private:
   enum class Reader { nobody, waiter, ownThread };
   enum class Received { something, nothing, end };
 
-  // What came in with one read; an event when `callID` is 0.
+  // An answer or, if `callID` is 0, an event.
   struct Arrived {
     std::uint32_t callID = 0;
     Answer answer;
@@ -76,14 +72,14 @@ class DaemonConnection {
 
   DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, EventHandler handler);
 
-  // The connection's thread.
+  // Called on the connection's thread.
   void run();
   void serve(std::uint32_t events) EXCLUDES(_lock);
   bool runReady() EXCLUDES(_lock);
 
-  // The holder of the reading role, without the lock.
+  // Called by the reader, without the lock. takeFrames() returns false if the connection must end.
   Received receive(int flags);
-  bool takeFrames();  // false when nothing sensible can follow
+  bool takeFrames();
   void waitForSocket(short events, int milliseconds = -1);
 
   veltra_status enqueue(std::string frame, CallTable::Call call) REQUIRES(_lock);
@@ -105,20 +101,25 @@ class DaemonConnection {
   Thread _thread;
   std::atomic<std::thread::id> _ownThread{};
 
-  // The holder of the reading role only.
+  // Used only by the reader.
   wire::FrameReader _frames;
   std::vector<Arrived> _arrived;
 
   Mutex _lock LEAF_LOCK{LockRank::leaf};
-  Reader _reader GUARDED_BY(_lock) = Reader::ownThread;  // which first takes what came behind the hello
-  std::vector<Waiter*> _parked GUARDED_BY(_lock);        // wait while another reads
+  // At first the connection's thread, which handles what followed the hello.
+  Reader _reader GUARDED_BY(_lock) = Reader::ownThread;
+  // Threads that wait while another one reads.
+  std::vector<Waiter*> _parked GUARDED_BY(_lock);
   OutFrames _out GUARDED_BY(_lock);
   CallTable _calls GUARDED_BY(_lock);
-  std::uint32_t _interest GUARDED_BY(_lock) = 0;  // what epoll was last told
+  // The events that epoll reports of the socket, and whether it reports any.
+  std::uint32_t _interest GUARDED_BY(_lock) = 0;
   bool _watched GUARDED_BY(_lock) = true;
-  bool _hungUp GUARDED_BY(_lock) = false;  // the daemon has ended; what it sent before may still be unread
+  // The daemon has ended the connection; what it sent before may still be unread.
+  bool _hungUp GUARDED_BY(_lock) = false;
   bool _ended GUARDED_BY(_lock) = false;
-  bool _stopping GUARDED_BY(_lock) = false;  // the thread ends once nothing is ready
+  // The thread ends as soon as nothing is ready.
+  bool _stopping GUARDED_BY(_lock) = false;
 };
 
 }  // namespace veltrad::client

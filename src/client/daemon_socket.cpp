@@ -1,4 +1,4 @@
-// Connecting and greeting; every way in which that fails has a line that says what to do.
+// Connects to the daemon and exchanges hellos. Every failure has a text that says what to do.
 #include "client/daemon_socket.h"
 
 #include <fmt/format.h>
@@ -32,20 +32,25 @@ ConnectFailure noDaemon(std::string text) {
   return {VELTRA_NO_DAEMON, std::move(text)};
 }
 
-const char* kindOfFile(mode_t mode) {
+const char* kindOfNonSocket(mode_t mode) {
   if (S_ISDIR(mode)) return "a directory";
   if (S_ISREG(mode)) return "a regular file";
   return "no socket";
 }
 
-// A file of another kind at the socket's place looks to connect() like a socket that nobody serves.
+ConnectFailure notVeltrad(const std::string& shown) {
+  return noDaemon(
+      fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
+}
+
+// connect() reports a file of another kind in the same way as a socket that nobody serves.
 ConnectFailure refusedConnection(const std::string& shown, const std::string& path) {
   struct stat facts {};
   if (::stat(path.c_str(), &facts) == 0 && !S_ISSOCK(facts.st_mode)) {
     return noDaemon(
         fmt::format("{} is {}, not the daemon's socket: remove it and start veltrad, or name another "
                     "root with VELTRA_ROOT or --root.",
-                    shown, kindOfFile(facts.st_mode)));
+                    shown, kindOfNonSocket(facts.st_mode)));
   }
   return noDaemon(fmt::format("The daemon that made {} has ended: start veltrad again.", shown));
 }
@@ -90,7 +95,7 @@ Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
   std::memcpy(address.sun_path, path.data(), path.size());
   FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!made.isOpen()) return Failure{noDaemon(fmt::format("No socket could be made: {}.", errorText(errno)))};
-  // Bounds the wait for a place in the listener's backlog, and the writing of the first frames.
+  // Limits the wait for a place in the listener's backlog, and the sending of the first frames.
   const timeval bound{kGreetingTimeout.count(), 0};
   ::setsockopt(made.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
   int failed;
@@ -135,7 +140,7 @@ Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, wire::Frame& frame)
   }
 }
 
-// Absent: the daemon's hello is as it must be.
+// Absent if the daemon's hello is valid.
 std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const std::string& shown) {
   const auto parsed = parseBinaryPropertyList(frame.body);
   const Dictionary* body = parsed ? parsed.value().asDictionary() : nullptr;
@@ -148,10 +153,7 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
     return ConnectFailure{VELTRA_REFUSED, std::move(refusal.description)};
   }
   const auto wire = body ? body->uint32(key::kWire) : std::nullopt;
-  if (frame.header.kind != wire::FrameKind::hello || !wire) {
-    return noDaemon(
-        fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
-  }
+  if (frame.header.kind != wire::FrameKind::hello || !wire) return notVeltrad(shown);
   if (*wire != wire::kWireVersion) {
     return ConnectFailure{
         VELTRA_REFUSED,
@@ -173,8 +175,7 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
   const std::string hello =
       wire::makeFrame(wire::FrameKind::hello, 0,
                       Dictionary{{key::kWire, Value(wire::kWireVersion)}, {key::kLibrary, veltra_version()}});
-  // A daemon that refuses may end the connection before all of this is written; its reason is still to be
-  // read.
+  // A daemon that refuses may end the connection before all is sent; its refusal can still be read.
   (void)sendAll(daemon.socket.get(), hello + firstCalls);
   const std::string shown = escapedForLog(path);
   wire::Frame frame;
@@ -192,8 +193,7 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
                                "again, or see its log.",
                                shown))};
     case Came::impossible:
-      return Failure{noDaemon(
-          fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown))};
+      return Failure{notVeltrad(shown)};
   }
   if (auto failure = verdictOnGreeting(frame, shown)) return Failure{std::move(*failure)};
   return daemon;

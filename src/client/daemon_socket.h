@@ -1,5 +1,4 @@
-// Reaching the daemon: connecting to its socket and the exchange of the first frames. On the thread of the
-// caller of veltra_session_create.
+// Connects to the daemon's socket and exchanges the first frames.
 #pragma once
 
 #include <chrono>
@@ -12,21 +11,24 @@
 
 namespace veltrad::client {
 
-// How long a daemon may take to accept a connection and to say hello.
+// The time that the daemon has to accept a connection and to send its hello.
 inline constexpr std::chrono::seconds kGreetingTimeout{5};
 
 struct ConnectFailure {
   veltra_status status;
-  std::string text;  // one line: what is wrong and what to do
+  // One line: what is wrong and what to do.
+  std::string text;
 };
 
 struct DaemonSocket {
-  FileDescriptor socket;     // connected, blocking, close-on-exec
-  wire::FrameReader reader;  // holds what came after the daemon's hello
+  // Connected, blocking, close-on-exec.
+  FileDescriptor socket;
+  // Holds the bytes that followed the daemon's hello.
+  wire::FrameReader reader;
 };
 
-// Connects to `path`, says hello and sends `firstCalls` (whole frames) behind it, and waits for the daemon's
-// hello, for `patience` at most.
+// Connects to `path`, sends a hello and `firstCalls`, which are whole frames, and waits at most `patience`
+// for the daemon's hello.
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience = kGreetingTimeout);
 

@@ -1,4 +1,4 @@
-// Reads with pread: the file's own position is its owner's.
+// Copies with pread, which leaves the file's position unchanged.
 #include "client/lent_copy.h"
 
 #include <fcntl.h>
@@ -32,28 +32,18 @@ FileDescriptor placeFor(off_t size) {
   return inDirectory(chosen && *chosen ? chosen : "/tmp");
 }
 
-bool writeAll(int to, const char* bytes, std::size_t count) {
-  while (count > 0) {
-    const ssize_t written = ::write(to, bytes, count);
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return false;
-    bytes += written;
-    count -= static_cast<std::size_t>(written);
-  }
-  return true;
-}
-
-bool copy(int from, int to, off_t size) {
+// 0, or an errno.
+int copy(int from, int to, off_t size) {
   std::string piece(kPieceBytes, '\0');
   for (off_t at = 0; at < size;) {
     const ssize_t count =
         ::pread(from, piece.data(), std::min(piece.size(), static_cast<std::size_t>(size - at)), at);
     if (count < 0 && errno == EINTR) continue;
-    if (count == 0) errno = ESTALE;
-    if (count <= 0 || !writeAll(to, piece.data(), static_cast<std::size_t>(count))) return false;
+    if (count <= 0) return count == 0 ? ESTALE : errno;
+    if (const int error = writeAll(to, {piece.data(), static_cast<std::size_t>(count)})) return error;
     at += count;
   }
-  return true;
+  return 0;
 }
 
 }  // namespace
@@ -61,13 +51,12 @@ bool copy(int from, int to, off_t size) {
 FileDescriptor copyOfFile(int file, off_t size) {
   FileDescriptor place = placeFor(size);
   if (!place.isOpen()) return place;
-  if (!copy(file, place.get(), size)) {
-    const int error = errno;
+  if (const int error = copy(file, place.get(), size)) {
     place.reset();
     errno = error;
     return place;
   }
-  // Refused where it is no file of memory.
+  // Fails, without harm, if it is not a memory file.
   ::fcntl(place.get(), F_ADD_SEALS, F_SEAL_SEAL | F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_WRITE);
   return place;
 }

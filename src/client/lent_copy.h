@@ -1,4 +1,4 @@
-// A copy of a file for the daemon, which takes none that others serve. The caller's thread.
+// Copies a file for the daemon, which does not take files of network or FUSE file systems.
 #pragma once
 
 #include <sys/types.h>
@@ -7,11 +7,10 @@
 
 namespace veltrad::client {
 
-// Up to here a copy stays in memory, sealed; a larger one is a file without a name in TMPDIR, or in /tmp.
+// A copy up to this size is a sealed memory file, a larger one an unnamed file in TMPDIR or /tmp.
 inline constexpr off_t kMostCopiedInMemory = 8 << 20;
 
-// The `size` bytes of `file`. Not open: they cannot be had or kept, and errno says why; ESTALE: the file
-// ended before.
+// A copy of the first `size` bytes of `file`. Not open on failure, with errno; ESTALE if the file is shorter.
 FileDescriptor copyOfFile(int file, off_t size);
 
 }  // namespace veltrad::client

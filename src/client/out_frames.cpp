@@ -1,4 +1,4 @@
-// Writing frames without blocking. Under the connection's lock.
+// Writes frames without blocking.
 #include "client/out_frames.h"
 
 #include <sys/socket.h>
@@ -33,7 +33,7 @@ ssize_t sendWithDescriptor(int socket, msghdr message, int descriptor) {
   return ::sendmsg(socket, &message, kFlags);
 }
 
-// The daemon then says that it has got no file.
+// The daemon then answers that no file was lent.
 void announceNoDescriptor(std::string& frame) {
   wire::FrameHeader header = wire::decodeFrameHeader(frame.data());
   header.descriptors = 0;
@@ -68,7 +68,7 @@ veltra_status OutFrames::write(int socket, std::string frame, std::shared_ptr<co
   _bytes += frame.size() - sent;
   _frames.push_back({std::move(frame), std::move(file)});
   if (!first || !lends || writeAll(socket)) return VELTRA_OK;
-  _frames.clear();  // refused, not lost
+  _frames.clear();  // counts as refused, not as lost
   stop();
   return refuse(VELTRA_NO_DAEMON);
 }
@@ -89,13 +89,13 @@ void OutFrames::stop() {
   _bytes = _firstTaken = 0;
 }
 
-// False: the peer takes nothing any more.
+// False if the connection has ended.
 bool OutFrames::writeAll(int socket) {
   while (!_frames.empty()) {
     const ssize_t sent = send(socket);
     if (sent >= 0) {
       taken(static_cast<std::size_t>(sent));
-    } else if (errno == ETOOMANYREFS && _frames.front().file) {  // too many descriptors are on their way
+    } else if (errno == ETOOMANYREFS && _frames.front().file) {  // too many descriptors are in transit
       announceNoDescriptor(_frames.front().bytes);
       _frames.front().file = nullptr;
     } else if (errno != EINTR) {
@@ -105,7 +105,7 @@ bool OutFrames::writeAll(int socket) {
   return true;
 }
 
-// As many frames as go at once: a descriptor travels with the first byte of the first.
+// Sends as many frames as possible at once. A descriptor is sent with the first byte of the first frame.
 ssize_t OutFrames::send(int socket) {
   iovec parts[kFramesAtOnce];
   std::size_t count = 0;

@@ -1,4 +1,4 @@
-// The frames of one session that wait for room in the socket. Under its connection's lock.
+// The frames of one session that wait to be written. Used under its connection's lock.
 #pragma once
 
 #include <sys/types.h>
@@ -14,38 +14,39 @@
 
 namespace veltrad::client {
 
-// Job: keeps whole frames in order and writes them without blocking. A frame counts as waiting until its last
-// byte was taken. Once the peer takes nothing any more it is stopped.
+// Keeps frames in order and writes them without blocking. A frame waits until its last byte is written. It
+// stops when the connection has ended.
 class OutFrames {
  public:
-  // So many bytes may wait, or one frame.
+  // At most `most` bytes may wait, or one larger frame.
   explicit OutFrames(std::size_t most) : _most(most) {}
 
   bool empty() const { return _frames.empty(); }
   std::size_t calls() const { return _frames.size(); }
 
-  // Writes `frame` at once when nothing waits before it; what the socket does not take, waits. Where its
-  // header announces a descriptor, `file` is open. VELTRA_QUEUE_FULL, or VELTRA_NO_DAEMON once it is closed
-  // or stopped: it is dropped.
+  // Writes as much of `frame` as possible if no other waits; the rest waits. If the header announces a
+  // descriptor, `file` must be open. The frame is dropped if the result is VELTRA_QUEUE_FULL or, after
+  // close() or stop(), VELTRA_NO_DAEMON.
   veltra_status write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file = nullptr);
-  // Writes what waits.
+  // Writes as much as possible of what waits.
   void writeWaiting(int socket);
-  // Takes no more frames.
+  // Accepts no more frames.
   void close() { _closed = true; }
   // The same, and drops what waits.
   void stop();
 
-  // Frames taken whole by the socket so far.
+  // Frames that were written completely.
   std::uint64_t written() const { return _written; }
-  // Frames that were taken here and never written.
+  // Frames that were accepted but never written.
   std::uint64_t lost() const { return _lost; }
-  // These, and those that were not taken.
+  // These, and the frames that were not accepted.
   std::uint64_t dropped() const { return _refused + _lost; }
 
  private:
   struct Waiting {
     std::string bytes;
-    std::shared_ptr<const UploadedFile> file;  // null: no descriptor is to travel any more
+    // Null if there is no descriptor to send, or it was sent.
+    std::shared_ptr<const UploadedFile> file;
   };
 
   veltra_status refuse(veltra_status why);
@@ -56,8 +57,10 @@ class OutFrames {
   const std::size_t _most;
   bool _closed = false;
   std::deque<Waiting> _frames;
-  std::size_t _firstTaken = 0;  // bytes of the first frame that the socket has
-  std::size_t _bytes = 0;       // that wait
+  // Bytes of the first frame that were written.
+  std::size_t _firstTaken = 0;
+  // Bytes that wait.
+  std::size_t _bytes = 0;
   std::uint64_t _written = 0;
   std::uint64_t _refused = 0;
   std::uint64_t _lost = 0;

@@ -1,4 +1,4 @@
-// The C interface's functions on sessions. Any thread.
+// The C interface's functions on sessions.
 #include <cstdlib>
 #include <cstring>
 
@@ -58,7 +58,7 @@ veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltr
   const veltra_status status = session ? call.status : VELTRA_INVALID;
   client::Answer answer;
   if (status == VELTRA_OK) {
-    const auto connection = session->connection;  // outlasts a close() that ends this call
+    const auto connection = session->connection;  // keeps it alive during a close() that ends this call
     answer = connection->sendAndWait(std::move(call.frame), std::move(call.file));
     client::settleUpload(*answer);
   } else {

@@ -1,4 +1,4 @@
-// Opening and removing a file by its directory. See the header for who does it.
+// Opens and removes a file relative to its directory.
 #include "client/uploaded_file.h"
 
 #include <fcntl.h>
@@ -19,7 +19,7 @@ namespace veltrad::client {
 
 namespace {
 
-constexpr off_t kMostBytes = 0x7fffffff;  // what the daemon takes
+constexpr off_t kMostBytes = 0x7fffffff;  // the daemon's limit
 
 std::string absolute(const std::string& path) {
   if (!path.empty() && path.front() == '/') return path;
@@ -37,28 +37,23 @@ const char* kindOfFile(mode_t mode) {
   return "a device";
 }
 
-// Nobody guesses it; with the file's name in it, so that a person who finds it knows what it is. Empty: the
-// system had no random bytes.
+// A name that cannot be guessed; it contains the file's name for people who find it. Empty if there are no
+// random bytes.
 std::string nameAside(const std::string& name) {
-  constexpr std::size_t kMostOfName = 200;  // with the rest below 255 bytes, what a directory can hold
+  constexpr std::size_t kMostOfName = 200;  // keeps the result below 255 bytes
   std::uint64_t random[2];
   if (::getrandom(random, sizeof random, GRND_NONBLOCK) != sizeof random) return {};
   return fmt::format(".{}.{:016x}{:016x}", name.substr(0, kMostOfName), random[0], random[1]);
 }
 
-// 0, or an errno. Replaces nothing. Where the file system cannot promise that (NFS, many of FUSE), by a link.
-int moveTo(int directory, const std::string& from, const std::string& to) {
+// 0, or an errno. Replaces nothing: if the file system lacks RENAME_NOREPLACE (NFS, some FUSE), it uses a
+// link, or a plain rename to a name that nobody else uses.
+int moveTo(int directory, const std::string& from, const std::string& to, bool nobodyUsesTo) {
   if (::renameat2(directory, from.c_str(), directory, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
   if (errno != EINVAL && errno != ENOSYS) return errno;
+  if (nobodyUsesTo) return ::renameat(directory, from.c_str(), directory, to.c_str()) == 0 ? 0 : errno;
   if (::linkat(directory, from.c_str(), directory, to.c_str(), 0) != 0) return errno;
   return ::unlinkat(directory, from.c_str(), 0) == 0 ? 0 : errno;
-}
-
-// 0, or an errno. To a name that nobody else uses, so that a plain rename serves, too.
-int moveAside(int directory, const std::string& from, const std::string& to) {
-  if (::renameat2(directory, from.c_str(), directory, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
-  if (errno != EINVAL && errno != ENOSYS) return errno;
-  return ::renameat(directory, from.c_str(), directory, to.c_str()) == 0 ? 0 : errno;
 }
 
 }  // namespace
@@ -80,7 +75,7 @@ void UploadedFile::open() {
     _problem = failed("cannot be opened", errno);
     return;
   }
-  // Before it is opened: a FIFO's writer would see a reader, and a device may do what its name promises.
+  // Only regular files are opened: opening a FIFO or a device may have effects.
   if (S_ISREG(_facts.st_mode)) {
     _file.reset(
         ::openat(_directory.get(), _name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
@@ -106,7 +101,7 @@ void UploadedFile::copyIfServedByOthers() {
   using Kind = wire::FileOrigin::Kind;
   const auto origin = wire::FileOrigin::of(_file.get(), 0);
   if (origin.kind == Kind::local) return;
-  // What is stacked the daemon takes, if it sees the same mounts: it is worth a copy in memory alone.
+  // The daemon takes a stacked file if it sees the same mounts, so only a copy in memory is worthwhile.
   if (origin.kind == Kind::stacked && _facts.st_size > kMostCopiedInMemory) return;
   _copy = copyOfFile(_file.get(), _facts.st_size);
   if (_copy.isOpen() || origin.kind == Kind::stacked) return;
@@ -114,8 +109,8 @@ void UploadedFile::copyIfServedByOthers() {
       failed(fmt::format("lies on a file system of type {} and cannot be copied", origin.fileSystem), errno);
 }
 
-// A look at what a path names is out of date when the path is removed. So it is first moved where nobody else
-// finds it, and what that was is seen there.
+// Checking a path and then removing it would be a race. So the file is first renamed to a name that nobody
+// else uses, and is checked under that name.
 std::optional<std::string> UploadedFile::remove() const {
   struct stat now {};
   if (::fstatat(_directory.get(), _name.c_str(), &now, AT_SYMLINK_NOFOLLOW) != 0) {
@@ -129,7 +124,7 @@ std::optional<std::string> UploadedFile::remove() const {
     return fmt::format("{} is stored, but has changed since, so it stays.", escapedForLog(_absolutePath));
   }
   const std::string aside = nameAside(_name);
-  const int error = aside.empty() ? EAGAIN : moveAside(_directory.get(), _name, aside);
+  const int error = aside.empty() ? EAGAIN : moveTo(_directory.get(), _name, aside, true);
   if (error == ENOENT) return failed("is stored, but cannot be found any more", error);
   if (error != 0) return failed("is stored, but cannot be removed", error);
   if (::fstatat(_directory.get(), aside.c_str(), &now, AT_SYMLINK_NOFOLLOW) != 0) {
@@ -151,9 +146,9 @@ bool UploadedFile::isSame(const struct stat& other) const {
   return S_ISREG(other.st_mode) && other.st_dev == _facts.st_dev && other.st_ino == _facts.st_ino;
 }
 
-// Empty: it stands under its name again.
+// Empty if the file has its name again.
 std::string UploadedFile::putBack(const std::string& aside) const {
-  const int error = moveTo(_directory.get(), aside, _name);
+  const int error = moveTo(_directory.get(), aside, _name, false);
   if (error == 0) return {};
   return fmt::format("{} is stored; another file that had taken its place is now {} beside it: {}.",
                      escapedForLog(_absolutePath), escapedForLog(aside),

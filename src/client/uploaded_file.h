@@ -1,4 +1,4 @@
-// A file that a session uploads: what is lent to the daemon, and the right to remove it, which stays here.
+// A file that a session uploads: it is lent to the daemon, and removed by the library.
 #pragma once
 
 #include <sys/stat.h>
@@ -10,28 +10,26 @@
 
 namespace veltrad::client {
 
-// Made by the caller of an upload, asked under its connection's lock, settled by the thread that takes the
-// answer. Holds the file and its directory open, so that neither another working directory nor a number used
-// again can make it remove what it did not lend. Of a file that others serve (FUSE, a network) it lends a
-// copy, made at once: the daemon waits for nobody's server.
+// Constructed by the caller of an upload, marked for removal under its connection's lock, and settled by the
+// thread that takes the answer. Keeps the file and its directory open, so that it never removes another file
+// if the working directory changes or an inode number is reused. For a file on a network or FUSE file system
+// it lends a copy, which it makes at once.
 class UploadedFile {
  public:
-  // Opens what `path` names without waiting for it; links are not followed, other than regular files not
-  // opened.
+  // Opens `path` if it is a regular file, without following a link and without blocking.
   explicit UploadedFile(const std::string& path);
 
-  // For people and for the file's name on the server.
   const std::string& absolutePath() const { return _absolutePath; }
-  // -1: it could not be opened.
+  // -1 if it could not be opened.
   int descriptor() const { return _copy.isOpen() ? _copy.get() : _file.get(); }
-  // One line on why no daemon takes it.
+  // One line that says why the daemon will not take it.
   const std::optional<std::string>& problem() const { return _problem; }
 
-  // The daemon has asked for its removal; only so does remove() make sense.
   void askForRemoval() { _removalAsked = true; }
   bool removalAsked() const { return _removalAsked; }
-  // Removes it if its path still names the same regular file; another one is never removed, whoever swaps
-  // files meanwhile. Nothing: done; else one line on why it stays, or where it is now.
+  // Removes the file if its path still names the same regular file; never removes another one, even if files
+  // are swapped meanwhile. Returns nothing on success, else one line that says why it stays or where it is
+  // now.
   std::optional<std::string> remove() const;
 
  private:
@@ -43,7 +41,8 @@ class UploadedFile {
 
   // Constant after construction.
   std::string _absolutePath;
-  std::string _name;  // in its directory
+  // Within its directory.
+  std::string _name;
   FileDescriptor _directory;
   FileDescriptor _file;
   FileDescriptor _copy;

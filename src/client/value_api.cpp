@@ -1,6 +1,6 @@
-// The C interface's functions on values. Any thread.
+// The C interface's functions on values.
 #include <cstring>
-#include <limits>
+#include <iterator>
 
 #include "base/text.h"
 #include "client/value_node.h"
@@ -9,7 +9,7 @@ using veltrad::Value;
 
 namespace {
 
-// A property list knows no text that is not Unicode.
+// Property lists hold only valid Unicode.
 std::string mended(std::string_view text) {
   return veltrad::isUTF8(text) ? std::string(text) : veltrad::toUTF8(text);
 }
@@ -87,27 +87,11 @@ veltra_type veltra_type_of(const veltra_value* value) {
   if (!value) return VELTRA_TYPE_NONE;
   if (value->items()) return VELTRA_TYPE_ARRAY;
   if (value->entries()) return VELTRA_TYPE_DICTIONARY;
-  switch (value->leaf()->type()) {
-    case Value::Type::boolean:
-      return VELTRA_TYPE_BOOLEAN;
-    case Value::Type::signedInteger:
-      return VELTRA_TYPE_SIGNED;
-    case Value::Type::unsignedInteger:
-      return VELTRA_TYPE_UNSIGNED;
-    case Value::Type::real:
-      return VELTRA_TYPE_REAL;
-    case Value::Type::string:
-      return VELTRA_TYPE_STRING;
-    case Value::Type::date:
-      return VELTRA_TYPE_DATE;
-    case Value::Type::data:
-      return VELTRA_TYPE_DATA;
-    case Value::Type::array:
-      return VELTRA_TYPE_ARRAY;
-    case Value::Type::dictionary:
-      return VELTRA_TYPE_DICTIONARY;
-  }
-  return VELTRA_TYPE_NONE;
+  static constexpr veltra_type kTypes[] = {VELTRA_TYPE_BOOLEAN, VELTRA_TYPE_SIGNED, VELTRA_TYPE_UNSIGNED,
+                                           VELTRA_TYPE_REAL,    VELTRA_TYPE_STRING, VELTRA_TYPE_DATE,
+                                           VELTRA_TYPE_DATA,    VELTRA_TYPE_ARRAY,  VELTRA_TYPE_DICTIONARY};
+  static_assert(std::size(kTypes) == static_cast<std::size_t>(Value::Type::dictionary) + 1);
+  return kTypes[static_cast<std::size_t>(value->leaf()->type())];
 }
 
 bool veltra_get_boolean(const veltra_value* value) {
@@ -115,7 +99,7 @@ bool veltra_get_boolean(const veltra_value* value) {
 }
 
 int64_t veltra_get_signed(const veltra_value* value) {
-  // Wrapping to 64 bits shows an unsigned value that does not fit as a negative one.
+  // An unsigned value that does not fit wraps to a negative one.
   if (isOf(value, Value::Type::signedInteger)) return value->leaf()->toInt64().value_or(0);
   if (!isOf(value, Value::Type::unsignedInteger)) return 0;
   const int64_t wrapped = value->leaf()->toInt64().value_or(0);
@@ -134,13 +118,8 @@ uint64_t veltra_get_unsigned(const veltra_value* value) {
 double veltra_get_real(const veltra_value* value) {
   if (!value || !value->leaf()) return 0;
   if (const veltrad::Date* date = value->leaf()->asDate()) return date->secondsSince1970;
-  if (!value->leaf()->isNumber()) return 0;
-  if (const auto finite = value->leaf()->toDouble()) return *finite;
-  constexpr double kInfinity = std::numeric_limits<double>::infinity();
-  for (const double infinite : {kInfinity, -kInfinity}) {
-    if (*value->leaf() == Value(infinite)) return infinite;
-  }
-  return std::numeric_limits<double>::quiet_NaN();
+  if (const double* real = value->leaf()->asReal()) return *real;
+  return value->leaf()->isNumber() ? value->leaf()->toDouble().value_or(0) : 0;
 }
 
 const char* veltra_get_string(const veltra_value* value, size_t* length) {

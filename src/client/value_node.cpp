@@ -1,13 +1,9 @@
-// Nodes, and their passage from and to the system's own value type. Any thread.
+// Nodes, and their conversion from and to veltrad::Value.
 #include "client/value_node.h"
 
 #include <limits>
 
 namespace {
-
-void releasePart(const veltra_value* part) {
-  veltra_release(part);
-}
 
 std::size_t plus(std::size_t a, std::size_t b) {
   return a > std::numeric_limits<std::size_t>::max() - b ? std::numeric_limits<std::size_t>::max() : a + b;
@@ -17,9 +13,9 @@ std::size_t plus(std::size_t a, std::size_t b) {
 
 veltra_value::~veltra_value() {
   if (const Items* all = items()) {
-    for (const veltra_value* item : *all) releasePart(item);
+    for (const veltra_value* item : *all) veltra_release(item);
   } else if (const Entries* all = entries()) {
-    for (const auto& entry : *all) releasePart(entry.second);
+    for (const auto& entry : *all) veltra_release(entry.second);
   }
   delete madeIndex.load(std::memory_order_relaxed);
 }
@@ -31,7 +27,7 @@ const veltra_value::Index& veltra_value::index() const {
   for (const auto& entry : *entries()) fresh->push_back(&entry);
   const Index* expected = nullptr;
   if (madeIndex.compare_exchange_strong(expected, fresh, std::memory_order_acq_rel)) return *fresh;
-  delete fresh;  // another reader was faster
+  delete fresh;  // another thread was faster
   return *expected;
 }
 
@@ -58,7 +54,7 @@ bool veltra_value::set(std::string key, veltra_value* part) {
   const auto [at, added] = all->try_emplace(std::move(key), part);
   if (!added) {
     if (objects != std::numeric_limits<std::size_t>::max()) objects -= at->second->objects;
-    releasePart(std::exchange(at->second, part));
+    veltra_release(std::exchange(at->second, part));
   }
   return true;
 }

@@ -1,5 +1,5 @@
-// The value behind the C interface's veltra_value: a node of a tree, counted, built up by its owner. Reading
-// a node is safe from any thread; building is its owner's, one thread at a time.
+// The C interface's veltra_value: a reference-counted node of a tree. Any thread may read a node; only its
+// owner changes it, one thread at a time.
 #pragma once
 
 #include <atomic>
@@ -12,8 +12,8 @@
 #include "base/value.h"
 #include "veltra/veltra.h"
 
-// A container holds one reference to each of its parts. A part is frozen, so that no value can come to
-// contain itself, and `depth` and `objects` of a finished part never change.
+// A container holds one reference to each of its parts. Parts cannot be changed, so that no value can contain
+// itself, and their `depth` and `objects` are constant.
 struct veltra_value {
   using Items = std::vector<veltra_value*>;
   using Entries = std::map<std::string, veltra_value*, std::less<>>;
@@ -27,16 +27,18 @@ struct veltra_value {
   const veltrad::Value* leaf() const { return std::get_if<veltrad::Value>(&held); }
   const Items* items() const { return std::get_if<Items>(&held); }
   const Entries* entries() const { return std::get_if<Entries>(&held); }
-  // The entries by number, made at the first request.
+  // The entries by number, built by the first call.
   const Index& index() const;
-  // Takes over a part; false when this would nest too deep or the container is itself a part already.
+  // Takes over a part. False if it would be nested too deep or the container is itself a part.
   bool append(veltra_value* part);
   bool set(std::string key, veltra_value* part);
 
   std::atomic<unsigned> references{1};
   std::atomic<bool> isPart{false};
-  int depth = 1;            // of nested containers, a leaf counting as one
-  std::size_t objects = 1;  // this value and all its parts, shared ones at each place
+  // The number of nested levels, including this value.
+  int depth = 1;
+  // This value and all its parts, shared ones counted at each place.
+  std::size_t objects = 1;
 
  private:
   bool admit(veltra_value* part);
@@ -47,7 +49,7 @@ struct veltra_value {
 
 namespace veltrad::client {
 
-// No value nests deeper, so every walk over one may recurse.
+// The limit makes it safe to recurse over a value.
 inline constexpr int kDeepestValue = 64;
 
 // Owns one reference.

@@ -1,4 +1,4 @@
-// The keys of a client entry and of what it holds.
+// The tables of the keys of a client entry, its filters and its country thresholds.
 #include "config/client_entry.h"
 
 #include "base/text.h"

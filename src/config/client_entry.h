@@ -1,5 +1,4 @@
-// An entry of the "clients" of an HTTPS post back end, parsed, with the table of its keys. Immutable once it
-// is parsed; any thread.
+// A parsed entry of the "clients" of an HTTPS post back end.
 #pragma once
 
 #include <cstddef>
@@ -22,17 +21,20 @@ void take(const Key& key, const Value& value, FilterAction& field);
 
 // One element of "filters".
 struct filterTag {
-  std::int32_t method = -1;  // negative: every method
-  std::int32_t status = -1;  // negative: every status
+  // A negative method or status matches every one.
+  std::int32_t method = -1;
+  std::int32_t status = -1;
   FilterAction action = FilterAction::keep;
-  std::optional<std::string> key;  // letter case is ignored; absent: matches nothing
+  // Letter case is ignored. Without a key the filter matches nothing.
+  std::optional<std::string> key;
 
   bool operator==(const filterTag&) const = default;
   static const KeyTable kKeys;
 };
 
 struct Filters {
-  std::size_t elements = 0;  // of the array, whatever they are
+  // The number of elements in the array, valid or not.
+  std::size_t elements = 0;
   // By their keys in lower case, in the order of the array.
   std::unordered_map<std::string, std::vector<filterTag>> ofKey;
 
@@ -49,7 +51,7 @@ struct CountryThreshold {
   static const KeyTable kKeys;
 };
 
-// Its 17 fields are the keys of an entry, in the order in which they are looked at.
+// Its 17 fields are the keys of an entry, in the order in which they are evaluated.
 struct ClientEntry {
   std::vector<std::string> client;
   std::vector<std::string> service;

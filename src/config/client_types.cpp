@@ -1,4 +1,4 @@
-// The fixed tables of client types and environments. Any thread.
+// The fixed tables of client types and environments.
 #include "config/client_types.h"
 
 #include <array>
@@ -21,7 +21,7 @@ constexpr std::array<const char*, 5> kSectionNames = {nullptr, "development", "f
 
 template <typename Table, typename Index>
 const char* entry(const Table& table, Index index) {
-  const auto place = static_cast<std::uint32_t>(index);  // what is negative lies beyond the end
+  const auto place = static_cast<std::uint32_t>(index);  // a negative index becomes one beyond the end
   return place < table.size() ? table[place] : nullptr;
 }
 

@@ -1,5 +1,5 @@
-// Tables of the keys of a storebag. One row makes a key known to the parser, to what decides by it and to
-// lint. Constants and plain functions; any thread.
+// Tables of the keys of storebags. One row makes a key known to the parser, to the code that uses it and to
+// lint.
 #pragma once
 
 #include <array>
@@ -14,19 +14,24 @@
 
 namespace veltrad::config {
 
+// url: a text that begins with https://. names: a text of names separated by commas, not trimmed. texts,
+// dictionaries: arrays. choice: one of a few texts. presence: any value; only the presence of the key
+// matters.
 enum class KeyType {
   text,
-  url,    // a text that begins with https://
-  names,  // a text: names between commas, not trimmed
-  texts,  // an array of texts
+  url,
+  names,
+  texts,
   integer,
   real,
-  presence,  // any value: that the key is there decides
+  presence,
   dictionary,
-  dictionaries,  // an array of dictionaries
+  dictionaries,
+  boolean,
+  choice
 };
 
-// Of a number. What lies outside is read all the same, as the key's field says.
+// The valid range of a number. The type of the key's field decides how a number outside is read.
 struct Range {
   double least = 0;
   double most = 0;
@@ -43,12 +48,15 @@ struct Key {
   KeyType type;
   Range range;
   Need need;
-  const char* byDefault;  // what holds without the key
+  // What applies without the key.
+  const char* byDefault;
   const char* meaning;
-  const KeyTable* inner = nullptr;  // the keys of the dictionary, or of each in the array
-  // Puts the value into the struct of its table; one of the wrong type leaves it as if the key were absent.
-  // Null: the daemon does not read the key.
+  // The keys of the dictionary, or of each dictionary in the array.
+  const KeyTable* inner = nullptr;
+  // Stores the value in the struct of its table; ignores one of the wrong type. Null if the daemon does not
+  // read the key.
   void (*read)(const Key&, const Value&, void* parsed) = nullptr;
+  const char* choices = nullptr;  // the texts of a choice, "|" between them
 };
 
 struct KeyTable : std::span<const Key> {
@@ -57,28 +65,31 @@ struct KeyTable : std::span<const Key> {
   const Key* find(std::string_view name) const;
 };
 
-// Whether the daemon takes the value as one of this type.
+// True if the daemon accepts the value as one of this type.
 bool fits(const Value& value, KeyType type);
 
-// The texts of an array, and the value as it stands, for log lines.
+// The texts of an array.
 struct TextList {
   std::vector<std::string> texts;
+  // For log lines.
   std::optional<Value> asGiven;
-  // Whether they read alike.
   bool operator==(const TextList& other) const { return texts == other.texts; }
 };
 
-void take(const Key& key, const Value& value, std::optional<std::string>& field);    // text, url
-void take(const Key& key, const Value& value, std::vector<std::string>& field);      // names
-void take(const Key& key, const Value& value, TextList& field);                      // texts
-void take(const Key& key, const Value& value, std::int32_t& field);                  // wraps to its width
-void take(const Key& key, const Value& value, std::optional<std::uint16_t>& field);  // wraps to its width
-void take(const Key& key, const Value& value, std::optional<std::int64_t>& field);   // kept within the range
+// Store a value in a field: text or url, names, texts.
+void take(const Key& key, const Value& value, std::optional<std::string>& field);
+void take(const Key& key, const Value& value, std::vector<std::string>& field);
+void take(const Key& key, const Value& value, TextList& field);
+// These wrap to the width of the field.
+void take(const Key& key, const Value& value, std::int32_t& field);
+void take(const Key& key, const Value& value, std::optional<std::uint16_t>& field);
+// Clamps to the key's range.
+void take(const Key& key, const Value& value, std::optional<std::int64_t>& field);
 void take(const Key& key, const Value& value, std::optional<double>& field);
-void take(const Key& key, const Value& value, bool& field);  // presence
+void take(const Key& key, const Value& value, bool& field);  // presence, boolean
 void take(const Key& key, const Value& value, std::optional<Dictionary>& field);
 
-// The row of a key of `Parsed`, which names its table "kKeys".
+// The row of a key of `Parsed`, whose table is Parsed::kKeys.
 template <typename Parsed>
 struct Row {
   Key key;
@@ -93,7 +104,7 @@ Parsed parsed(const Dictionary& dictionary) {
   return result;
 }
 
-// Elements that are no dictionaries are passed over.
+// Skips elements that are not dictionaries.
 template <typename Parsed>
 void take(const Key&, const Value& value, std::optional<std::vector<Parsed>>& field) {
   const Array* array = value.asArray();
@@ -116,7 +127,7 @@ constexpr auto row(Key key) {
   return Row<Parsed>{key};
 }
 
-// A table takes the rows of its own struct alone.
+// All rows of a table must be of the same struct.
 template <typename Parsed, std::size_t N>
 constexpr std::array<Key, N> keysOf(const Row<Parsed> (&rows)[N]) {
   std::array<Key, N> keys{};

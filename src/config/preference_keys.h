@@ -25,6 +25,7 @@ inline constexpr const char* kTimeDomain = "com.florn.timed";
 inline constexpr const char* kAutomaticTimeZone = "TMAutomaticTimeZoneEnabled";
 }  // namespace preference
 
+// Of ProcessSettings::currentEnvironment().
 inline constexpr std::uint32_t kEnvironmentCount = 5;
 inline constexpr std::uint32_t kInternalEnvironment = 2;
 inline constexpr std::uint32_t kSeedEnvironment = 3;

@@ -1,4 +1,4 @@
-// The settings that hold for the life of the process. Any thread.
+// Settings that are constant for the life of the process. Any thread may ask.
 #pragma once
 
 #include <cstdint>
@@ -6,6 +6,7 @@
 #include <string>
 
 #include "base/mutex.h"
+#include "platform/local_settings.h"
 
 namespace veltrad::platform {
 class FileStore;
@@ -18,41 +19,42 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
-// Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
-// the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
-// `main` owns the one object of the process. What the constructor takes must outlive it.
+// Each setting is computed at its first call and kept: a preference that changes later takes effect at the
+// next start. During a shortage a setting is absent, and a later call computes it. What the constructor takes
+// must outlive it.
 class ProcessSettings {
  public:
-  // `deploymentPath`: a property list with the texts "internalStorebagHost" and "publicStorebagHost", each a
-  // host name with an optional port; example hosts stand in for what is missing.
+  // `deploymentPath`: of either form; the file holds the texts "internalStorebagHost" and
+  // "publicStorebagHost", each a host name with an optional port; example hosts stand in for what is missing.
   ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
-                  platform::FileStore& files, std::string deploymentPath);
+                  platform::FileStore& files, const std::string& deploymentPath);
 
   // 0 to 4; 0 names no section of a storebag.
   std::optional<std::uint32_t> currentEnvironment();
-  // No slash at its end, unless the preference has one.
+  // Without a slash at the end, unless the preference has one.
   std::optional<std::string> storebagServerURL();
-  bool isInternalBuild();
+  // Reads the deployment file again, if the address comes from there; for a broken file it stays as it is.
+  void readDeploymentAgain();
 
  private:
-  // The type, and the one that was refused for it.
+  // The type, and the invalid one that it replaces.
   struct Environment {
     std::uint32_t type;
     std::optional<std::uint32_t> refused;
   };
   std::optional<Environment> userDefaultsEnvironment();
-  std::optional<std::string> computeStorebagServerURL();
+  std::optional<std::string> deployedStorebagServerURL();
   std::optional<std::string> storebagHost(bool internalBuild);
 
   // Constant after construction.
   platform::Preferences& _preferences;
   support::DeviceIdentity& _device;
-  platform::FileStore& _files;
-  const std::string _deploymentPath;
 
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // what was computed first is kept
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<std::uint32_t> _environment GUARDED_BY(_mutex);
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
+  bool _fromDeployment GUARDED_BY(_mutex) = false;  // there was no preference at the first call
+  platform::LocalSettings _deployment GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::config

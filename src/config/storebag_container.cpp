@@ -1,4 +1,4 @@
-// From the bytes of a storebag container to the storebag. Pure functions; any thread.
+// Reads a storebag container and the storebag in it.
 #include "config/storebag_container.h"
 
 #include "base/base64.h"

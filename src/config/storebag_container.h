@@ -1,5 +1,5 @@
-// The signed container that a storebag arrives in: from bytes to the texts in it, to the bytes that are
-// signed, to the storebag. Pure functions over bytes that nobody vouches for; any thread.
+// Reads, from untrusted bytes, the signed container of a storebag: its texts, the signed bytes, and the
+// storebag.
 #pragma once
 
 #include <optional>
@@ -12,28 +12,26 @@
 
 namespace veltrad::config {
 
-// Storebags are some kilobytes. The container is parsed before it is trusted, so its bounds keep whatever
-// bytes a server sends within 100 ms of CPU and 16 MiB of memory; it needs two texts and has room for a few
-// keys more.
+// The container is parsed before it is trusted. Its limits keep any bytes within 100 ms of CPU time and 16
+// MiB of memory, and leave room for a few more keys.
 inline constexpr std::size_t kStorebagMostContainerBytes = 2u << 20;
 inline constexpr PropertyListLimits kStorebagContainerLimits{.bytes = kStorebagMostContainerBytes,
                                                              .depth = 8,
                                                              .objects = 1'000,
                                                              .textBytes = kStorebagMostContainerBytes};
-// The bag is parsed only when its signature holds; its bounds keep a mistake at the signing desk within the
-// same.
+// The bag is parsed only if its signature is valid. Its limits protect against mistakes when it was made.
 inline constexpr PropertyListLimits kStorebagBagLimits{.bytes = kStorebagMostContainerBytes,
                                                        .depth = 32,
                                                        .objects = 65'536,
                                                        .textBytes = kStorebagMostContainerBytes};
 
-// The texts of the container; one that is missing or no text is absent.
+// The texts of the container, in base64: the signature over the decoded bag, and the bag, a property list.
 struct StorebagContainer {
-  std::optional<std::string> signature;  // base64 of the signature over the decoded bag
-  std::optional<std::string> bag;        // base64 of the storebag, itself a property list
+  std::optional<std::string> signature;
+  std::optional<std::string> bag;
 };
 
-// A property list that is no dictionary is a container with nothing in it.
+// A property list that is not a dictionary gives an empty container.
 Result<StorebagContainer, PropertyListError> parseStorebagContainer(std::string_view bytes);
 
 struct SignedStorebag {
@@ -41,10 +39,10 @@ struct SignedStorebag {
   std::string bag;
 };
 
-// Nothing when either text is absent or no base64; characters outside the alphabet are skipped.
+// Absent if either text is absent or not base64; characters outside the alphabet are skipped.
 std::optional<SignedStorebag> decodeStorebagContainer(const StorebagContainer& container);
 
-// The storebag in bag bytes that have been verified; nothing when they are no dictionary within the bounds.
+// The storebag in a bag that was verified; absent if it is not a dictionary within the limits.
 std::optional<Dictionary> parseStorebagBag(std::string_view bag);
 
 }  // namespace veltrad::config

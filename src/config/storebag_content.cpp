@@ -1,4 +1,4 @@
-// The keys of a storebag down to those of its client entries.
+// The tables of the keys of a storebag, its sections and its back ends.
 #include "config/storebag_content.h"
 
 #include "wire/constants.h"
@@ -42,7 +42,7 @@ constexpr auto kUploadKeys = keysOf<UploadProfile>({
         {"display_url", text, kUnbounded, optional, "none", "Address that clients may show to their user."}),
 });
 
-// The daemon reads nothing of it.
+// The daemon does not read this entry.
 constexpr std::array<Key, 1> kAdaptorKeys{Key{"active", presence, kUnbounded, optional, "nothing",
                                               "Marks the entry for the reader; it has no effect."}};
 constexpr KeyTable kAdaptorTable{kAdaptorKeys};

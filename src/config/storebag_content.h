@@ -1,5 +1,5 @@
-// What a storebag says, parsed once when it is taken in: its top level, the section of an environment, and
-// what each back end reads of it. Immutable; sessions share it; any thread.
+// A parsed storebag: its top level, the section of an environment, and the entries of back ends. Immutable
+// and shared by sessions.
 #pragma once
 
 #include <cstdint>
@@ -15,7 +15,7 @@
 
 namespace veltrad::config {
 
-// Of "httppost" and "httppost2".
+// The entry of "httppost" or "httppost2".
 struct HTTPSPostProfile {
   std::optional<std::vector<ClientEntry>> clients;
   std::optional<std::string> displayURL;
@@ -24,7 +24,7 @@ struct HTTPSPostProfile {
   static const KeyTable kKeys;
 };
 
-// "reliable": there with any value, it switches acknowledgements on.
+// The key "reliable", which switches acknowledgements on with any value.
 struct Reliable {
   bool on = false;
   std::int32_t milliseconds = 0;
@@ -33,7 +33,7 @@ struct Reliable {
 };
 void take(const Key& key, const Value& value, Reliable& field);
 
-// Of "dashboard".
+// The entry of "dashboard".
 struct DashboardProfile {
   std::optional<std::string> ip;
   std::optional<std::uint16_t> port;
@@ -45,7 +45,7 @@ struct DashboardProfile {
   static const KeyTable kKeys;
 };
 
-// Of "uploadserver".
+// The entry of "uploadserver".
 struct UploadProfile {
   std::optional<std::string> postURL;
   std::optional<std::string> displayURL;
@@ -59,7 +59,7 @@ using Profile = std::variant<HTTPSPostProfile, DashboardProfile, UploadProfile>;
 // The back ends of one environment.
 struct StorebagSection {
   Dictionary asGiven;
-  // Every entry by its name, known or not. Null: what its back end reads of it is nothing.
+  // All entries by name. Null if the back end is unknown or its entry is not read.
   std::map<std::string, std::shared_ptr<const Profile>> backends;
 
   static const KeyTable kKeys;
@@ -73,7 +73,8 @@ struct Storebag {
   std::optional<Dictionary> seed;
   std::optional<Dictionary> release;
   std::optional<std::string> version;
-  std::optional<std::int64_t> refreshCycle;  // seconds; within 32 bits
+  // In seconds, within 32 bits.
+  std::optional<std::int64_t> refreshCycle;
 
   bool operator==(const Storebag&) const = default;
   static const KeyTable kKeys;

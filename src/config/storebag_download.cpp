@@ -1,4 +1,4 @@
-// Downloads one storebag and verifies its signature. Runs on the caller's thread.
+// Downloads storebags and verifies their signatures.
 #include "config/storebag_download.h"
 
 #include <fmt/format.h>
@@ -22,7 +22,7 @@ constexpr std::chrono::milliseconds kStorebagTimeout{15'000};
 constexpr std::int32_t kDefaultMaxAgeSeconds = 86'400;
 constexpr const char* kNameWithDefault = "quindle";
 
-// Digits after an optional sign, whatever follows; no digits: 0. Kept within 32 bits.
+// The digits after an optional sign; 0 if there are none. Clamped to 32 bits.
 std::int32_t leadingInteger(std::string_view text) {
   constexpr std::int64_t kMost = std::numeric_limits<std::int32_t>::max();
   const bool negative = text.starts_with('-');
@@ -49,7 +49,7 @@ http::HTTPRequest requestForStorebag(std::string url, const std::optional<std::s
   return request;
 }
 
-// True when the server says that the copy is current; otherwise the text has become the answer's.
+// True if the caller's copy is current; otherwise `lastModified` is set to the answer's text.
 bool isNotModified(const http::HTTPResponse& response, std::optional<std::string>& lastModified) {
   const std::optional<std::string_view> header = response.header("Last-Modified");
   if (!header) return false;
@@ -80,7 +80,7 @@ StorebagCause causeOf(const http::HTTPError& error) {
   return StorebagCause::noAnswer;
 }
 
-// All lines of the header as one.
+// All lines of the header, joined.
 std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   std::optional<std::string> all;
   for (const auto& [name, value] : response.headers) {
@@ -132,9 +132,9 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
   }
   const std::string url = *server + "/" + name + "?version=" + version.value();
   logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
-  const http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
+  http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
   if (!result) return without(url, result.error());
-  const http::HTTPResponse& response = result.value();
+  http::HTTPResponse& response = result.value();
   answer.status = response.status;
   answer.maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   answer.lastModified = lastModified;
@@ -153,6 +153,7 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
   answer.genuine = true;
   answer.kind = StorebagAnswer::Kind::fetched;
   answer.storebag = std::move(storebag).value();
+  answer.container = std::move(response.body);
   return answer;
 }
 
@@ -163,7 +164,7 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
   answer.cause = causeOf(error);
   answer.why = error.description;
   answer.status = error.status;
-  if (error.kind == Kind::tooLarge) {  // an answer, but no storebag
+  if (error.kind == Kind::tooLarge) {  // the server has answered
     answer.maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
     logError("fetchStorebagWithName: Signature is missing");
@@ -184,7 +185,7 @@ Result<Dictionary, StorebagDownload::Refusal> StorebagDownload::verifiedStorebag
   using Cause = StorebagCause;
   const auto container = parseStorebagContainer(body);
   if (!container) {
-    const std::string& why = container.error().detail;
+    const std::string& why = container.error().description();
     logError("fetchStorebagWithName: propertyListWithData error %s", why.c_str());
     logError("fetchStorebagWithName: Signature is missing");
     return Failure{Refusal{Cause::noStorebag, "the answer is no property list: " + why, {}}};

@@ -1,5 +1,4 @@
-// Downloads one storebag and verifies its signature. Runs on the caller's thread and blocks it for the
-// exchange.
+// Downloads storebags and verifies their signatures. Blocks the caller's thread.
 #pragma once
 
 #include <cstdint>
@@ -14,7 +13,6 @@
 namespace veltrad::http {
 class HTTPClient;
 struct HTTPError;
-struct HTTPResponse;
 }  // namespace veltrad::http
 
 namespace veltrad::support {
@@ -25,38 +23,39 @@ namespace veltrad::config {
 
 class ProcessSettings;
 
-// The lifetime in seconds that a "Cache-Control" value allows: the leading integer of the component after the
-// first "max-age", components ending at every "=" and every space; kept within 32 bits. 86,400 where there is
-// none.
+// The lifetime in seconds by a "Cache-Control" value: the leading integer of the component after the first
+// "max-age", where components end at every "=" and every space; clamped to 32 bits. 86,400 if there is none.
 std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl);
 
-// What stands in for the storebag "quindle" while its server cannot be reached.
+// Replaces the storebag "quindle" while its server cannot be reached.
 Dictionary defaultStorebag();
 
 struct WholeStorebagAnswer : StorebagAnswer {
-  Dictionary storebag;  // verified, where it was fetched
+  Dictionary storebag;    // verified, where it was fetched
+  std::string container;  // its signed bytes; empty for a default storebag
 };
 
-// Keeps no state between calls; any number of threads at once. What the constructor takes must outlive it.
+// Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
+// it.
 class StorebagDownload {
  public:
   StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
 
-  // `lastModified`, the "Last-Modified" text of the copy
-  // that the caller holds, makes the request conditional.
+  // `lastModified`, the "Last-Modified" text of the caller's copy, makes the request conditional.
   WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
                                             const std::optional<std::string>& lastModified);
 
- private:
   struct Refusal {
     StorebagCause cause;  // noAttempt: the key is out of reach just now
     std::string why;
     std::optional<bool> genuine;  // as in StorebagAnswer
   };
+  // The storebag in the bytes of a container, by the key of today. A refusal has been logged.
+  Result<Dictionary, Refusal> verifiedStorebag(std::string_view container) const;
 
+ private:
   WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
                                     const http::HTTPError& error) const;
-  Result<Dictionary, Refusal> verifiedStorebag(std::string_view body) const;
 
   http::HTTPClient& _http;
   ProcessSettings& _settings;

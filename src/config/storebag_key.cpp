@@ -1,5 +1,4 @@
-// RSA verification with OpenSSL's EVP: never a verify without a digest, never padding parsed by hand. Any
-// thread.
+// Verifies RSA signatures with OpenSSL's EVP interface, which checks digest and padding.
 #include "config/storebag_key.h"
 
 #include <fmt/format.h>
@@ -24,7 +23,7 @@ struct Deleter {
 };
 using LibraryContext = std::unique_ptr<OSSL_LIB_CTX, Deleter<OSSL_LIB_CTX_free>>;
 using Provider = std::unique_ptr<OSSL_PROVIDER, Deleter<OSSL_PROVIDER_unload>>;
-using Key = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
+using PublicKey = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
 using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
 using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
 using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
@@ -37,21 +36,21 @@ const unsigned char* bytesOf(std::string_view text) {
   return reinterpret_cast<const unsigned char*>(text.data());
 }
 
-// A refusal is no error of the thread's: others read the same queue.
+// Removes the errors of a refusal from the thread's queue, which other code reads.
 class ErrorQueueAsItWas {
  public:
   ErrorQueueAsItWas() { ERR_set_mark(); }
   ~ErrorQueueAsItWas() { ERR_pop_to_mark(); }
 };
 
-Key decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
+PublicKey decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
   EVP_PKEY* key = nullptr;
   const Decoder decoder(
       OSSL_DECODER_CTX_new_for_pkey(&key, "DER", structure, "RSA", EVP_PKEY_PUBLIC_KEY, library, nullptr));
   const unsigned char* at = bytesOf(der);
   std::size_t left = der.size();
   const bool decoded = decoder != nullptr && OSSL_DECODER_from_data(decoder.get(), &at, &left) == 1;
-  Key held(key);
+  PublicKey held(key);
   return decoded && left == 0 ? std::move(held) : nullptr;
 }
 
@@ -59,7 +58,7 @@ bool isUsable(const EVP_PKEY* key) {
   if (EVP_PKEY_is_a(key, "RSA") != 1) return false;
   const int bits = EVP_PKEY_get_bits(key);
   if (bits < StorebagKey::kFewestModulusBits || bits > StorebagKey::kMostModulusBits) return false;
-  // Under an exponent of 1 every padded digest is its own signature.
+  // With an exponent of 1, every padded digest is its own signature.
   BIGNUM* exponent = nullptr;
   if (EVP_PKEY_get_bn_param(key, OSSL_PKEY_PARAM_RSA_E, &exponent) != 1) return false;
   const Number held(exponent);
@@ -68,21 +67,16 @@ bool isUsable(const EVP_PKEY* key) {
 
 }  // namespace
 
-// In this order: the key goes first when it is freed.
+// Destroyed in reverse order, the key first.
 struct StorebagKey::Held {
   LibraryContext library;
   Provider provider;
-  Key key;
+  PublicKey key;
 };
-
-StorebagKey::StorebagKey(std::unique_ptr<Held> held) : _held(std::move(held)) {}
-StorebagKey::StorebagKey(StorebagKey&&) noexcept = default;
-StorebagKey& StorebagKey::operator=(StorebagKey&&) noexcept = default;
-StorebagKey::~StorebagKey() = default;
 
 std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {
   const ErrorQueueAsItWas errors;
-  auto held = std::make_unique<Held>();
+  const auto held = std::make_shared<Held>();
   held->library.reset(OSSL_LIB_CTX_new());
   if (!held->library) return std::nullopt;
   held->provider.reset(OSSL_PROVIDER_load(held->library.get(), "default"));
@@ -90,7 +84,7 @@ std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {
   held->key = decodeKey(der, "SubjectPublicKeyInfo", held->library.get());
   if (!held->key) held->key = decodeKey(der, "type-specific", held->library.get());
   if (!held->key || !isUsable(held->key.get())) return std::nullopt;
-  return StorebagKey(std::move(held));
+  return StorebagKey(held);
 }
 
 bool StorebagKey::verifies(std::string_view bag, std::string_view signature) const {
@@ -127,11 +121,6 @@ int StorebagKey::modulusBits() const {
 }
 const void* StorebagKey::identity() const {
   return _held->key.get();
-}
-
-bool verifySignature(std::string_view publicKeyDER, std::string_view bag, std::string_view signature) {
-  const std::optional<StorebagKey> key = StorebagKey::fromDER(publicKeyDER);
-  return key && key->verifies(bag, signature);
 }
 
 }  // namespace veltrad::config

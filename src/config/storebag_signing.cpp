@@ -1,4 +1,4 @@
-// Keys that sign storebags. Any thread.
+// Keys that sign storebags, with OpenSSL.
 #include "config/storebag_signing.h"
 
 #include <openssl/bio.h>
@@ -17,7 +17,7 @@
 namespace veltrad::config {
 namespace {
 
-using Key = std::shared_ptr<EVP_PKEY>;
+using PrivateKey = std::shared_ptr<EVP_PKEY>;
 using Memory = std::unique_ptr<BIO, decltype(&BIO_free)>;
 
 constexpr std::size_t kMostKeyFileBytes = 1u << 16;
@@ -33,18 +33,18 @@ std::string contentsOf(BIO* memory) {
   return std::string(bytes, static_cast<std::size_t>(length));
 }
 
-// Never asks for a passphrase on the terminal: an encrypted key is refused.
+// Refuses encrypted keys instead of asking for a passphrase on the terminal.
 int noPassphrase(char*, int, int, void*) {
   return -1;
 }
 
 }  // namespace
 
-SigningKey::SigningKey(Key key) : _key(std::move(key)) {}
+SigningKey::SigningKey(PrivateKey key) : _key(std::move(key)) {}
 
 SigningKey SigningKey::generate(int bits) {
   if (bits < kFewestBits || bits > kMostBits) abortFor("make a key of that size");
-  Key key(EVP_RSA_gen(static_cast<unsigned>(bits)), EVP_PKEY_free);
+  PrivateKey key(EVP_RSA_gen(static_cast<unsigned>(bits)), EVP_PKEY_free);
   if (!key) abortFor("make a key");
   return SigningKey(std::move(key));
 }
@@ -54,7 +54,7 @@ Result<SigningKey, std::string> SigningKey::load(const std::string& path) {
   const auto pem = files.read(path, kMostKeyFileBytes);
   if (!pem) return Failure{pem.error().description};
   const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())), BIO_free);
-  Key key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
+  PrivateKey key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
   if (!key || EVP_PKEY_is_a(key.get(), "RSA") != 1)
     return Failure{path + ": expected an RSA private key in PEM form, not encrypted"};
   const int bits = EVP_PKEY_get_bits(key.get());

@@ -1,4 +1,4 @@
-// Keys that sign storebags, and the container that carries a signed one. The daemon never signs; any thread.
+// Keys that sign storebags, and the signed container, for tools; the daemon never signs.
 #pragma once
 
 #include <memory>
@@ -12,21 +12,22 @@ struct evp_pkey_st;
 
 namespace veltrad::config {
 
-// An RSA private key; copies share it. Signs with PKCS#1 v1.5 over SHA-1, which is what the daemon verifies.
+// An RSA private key, shared by copies. Signs with PKCS#1 v1.5 and SHA-1, which the daemon verifies.
 class SigningKey {
  public:
   static constexpr int kFewestBits = 2'048;
   static constexpr int kMostBits = 8'192;
 
-  // Aborts when `bits` is out of bounds or the system has no randomness to give.
+  // Aborts if `bits` is out of bounds or the system has no random bytes.
   static SigningKey generate(int bits = kFewestBits);
-  // A private key in PEM (PKCS#8 or PKCS#1, not encrypted) of a size in bounds. The error names the path and
-  // what was expected.
+  // From a PEM file (PKCS#8 or PKCS#1, not encrypted). The error names the path and what was expected.
   static Result<SigningKey, std::string> load(const std::string& path);
 
-  std::string privatePEM() const;  // PKCS#8
-  std::string publicDER() const;   // SubjectPublicKeyInfo
-  // As long as the modulus, over the SHA-1 digest of `bag`.
+  // PKCS#8.
+  std::string privatePEM() const;
+  // SubjectPublicKeyInfo.
+  std::string publicDER() const;
+  // The signature over the SHA-1 digest of `bag`.
   std::string sign(std::string_view bag) const;
 
  private:
@@ -34,10 +35,9 @@ class SigningKey {
   std::shared_ptr<evp_pkey_st> _key;
 };
 
-// The container around the storebag, written as a property list in XML form: itself one, with the base64
-// texts "signature" and "bag".
+// An XML property list with the base64 texts "signature" and "bag", the latter of the storebag in XML form.
 std::string makeStorebagContainer(const SigningKey& key, const Dictionary& storebag);
-// The same around bag bytes as they are.
+// The same for a bag of any bytes.
 std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag);
 
 }  // namespace veltrad::config

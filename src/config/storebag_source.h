@@ -1,4 +1,4 @@
-// Where the agent gets storebag sections from, and what comes of asking for one. The caller's thread.
+// The interface from which the agent gets storebag sections, and its answers.
 #pragma once
 
 #include <cstdint>
@@ -26,18 +26,16 @@ enum class StorebagCause {
   noSection,   // nothing for this environment
 };
 
-// What came of asking for a storebag.
 struct StorebagAnswer {
-  // fetched: here it is. notModified: the copy that the caller holds is current. failed: neither; the log has
-  // said why.
+  // notModified: the caller's copy is current. failed: the reason was logged.
   enum class Kind { fetched, notModified, failed };
   Kind kind = Kind::failed;
-  // False: for a shortage it could not begin, or its answer not be judged, or the daemon is stopping. Nothing
-  // of it is to be remembered; what was fetched all the same is for this session.
+  // False if a shortage prevented the request or the check of the answer, or the daemon is stopping. Then the
+  // answer must not be cached; a storebag in it is only for this session.
   bool attempted = true;
-  std::int32_t maxAge = 0;  // seconds; 0 where no answer came
-  // What makes the next request conditional: the answer's own text, even of one that then did not verify, or
-  // what this request was made with.
+  // In seconds; 0 if there was no answer.
+  std::int32_t maxAge = 0;
+  // For the next request: the answer's text, even if the answer was not valid, or that of this request.
   std::optional<std::string> lastModified;
   StorebagCause cause = StorebagCause::none;
   std::string why;              // one line about the cause; empty for `none`
@@ -46,18 +44,29 @@ struct StorebagAnswer {
 };
 
 struct StorebagSectionAnswer : StorebagAnswer {
-  std::shared_ptr<const StorebagSection> section;  // where it was fetched, else null
-  std::optional<std::string> version;              // of its storebag, which need not state one
+  // Null unless it was fetched.
+  std::shared_ptr<const StorebagSection> section;
+  // Of its storebag, which need not have one.
+  std::optional<std::string> version;
+};
+
+// What an earlier daemon has kept of a storebag.
+struct KeptSection {
+  bool known = false;  // false: not asked to keep any, or nobody can say just now
+  StorebagSectionAnswer answer;
+  double fetchTime = 0;  // of the answer, seconds since 1970
 };
 
 class StorebagSource {
  public:
   virtual ~StorebagSource() = default;
 
-  // The section of the client type's storebag for the process's environment. `lastModified`: of the copy that
-  // the caller holds. May block for an exchange with the server; takes no lock of its own.
+  // The section of the client type's storebag for the process's environment. `lastModified` is the text of
+  // the caller's copy. May block for a request to the server.
   virtual StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) = 0;
+  // What is kept of the client type's storebag, verified again; it has a section, or nothing is there to use.
+  virtual KeptSection keptStorebag(std::int32_t) { return {}; }
 };
 
 }  // namespace veltrad::config

@@ -66,7 +66,8 @@ bool makeDirectories(const platform::Root& root) {
 
 // Called after the daemon has taken its lock, because another daemon may be writing the files before.
 void removeUnfinishedFiles(const platform::Root& root) {
-  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory()}) {
+  for (const std::string& directory :
+       {root.runDirectory(), root.stateDirectory(), root.preferencesDirectory(), root.storebagsDirectory()}) {
     const std::size_t removed = platform::removeUnfinishedFiles(directory);
     if (removed > 0) logInfo("main: %zu unfinished files removed from %s", removed, directory.c_str());
   }
@@ -100,19 +101,21 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
-           daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
+           platform::CountersFile& countersFile, daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+  daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  // Connections free memory on their own threads after their sessions have gone, so memory is returned
-  // several times.
+  // The last threads may still be ending.
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
-  loop.run(tick, [&] {
+  const auto onTick = [&] {
     countersFile.writeSoon();
     metricsFile.writeSoon();
-    const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
+    // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
+    const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
+                      services.memory.used() == 0 && services.http.underWay() == 0;
     // Detects sessions that came and went between two ticks.
     const std::uint64_t acceptedNow = agent.acceptedSessions();
     if (!idle || acceptedNow != accepted) {
@@ -120,9 +123,14 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
       returns = kTicksToReturnMemory;
     } else if (returns > 0) {
       --returns;
+      daemon.backends().rest();
       platform::returnFreeMemory();
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
+  };
+  loop.run(tick, onTick, [&] {
+    logInfo("main: SIGHUP, configuration is read again");
+    daemon.readConfigurationAgain();
   });
 }
 
@@ -205,7 +213,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), countersFile, metricsFile, loop);
+  serve(services, daemon, listener, countersFile, metricsFile, loop);
 
   const bool ended = stop(services, listener, control, countersFile);
   daemon.backends().sayRest();

@@ -1,4 +1,4 @@
-// Reads JSON: RapidJSON's events, without recursion, straight into values. Any thread.
+// Reads JSON with RapidJSON's iterative parser, whose events become values directly.
 #include <fmt/format.h>
 #include <rapidjson/error/en.h>
 #include <rapidjson/memorystream.h>
@@ -16,16 +16,17 @@ namespace {
 
 constexpr std::size_t kDepthLimit = 64;
 
-// Takes RapidJSON's events; its operations have RapidJSON's names. An event that returns false ends the
-// reading.
+// Receives RapidJSON's events and has the names of its interface. An event that returns false ends the
+// parsing.
 class Handler {
  public:
   bool Null() {
     if (_open.empty() || !_open.back().isDictionary) return fail("null outside an object");
-    return true;  // the entry is left out
+    return true;
   }
   bool Bool(bool value) { return add(value); }
-  // Numbers come as texts (the other number events never): RapidJSON's own conversion stumbles over 0e300.
+  // Numbers arrive as texts, because RapidJSON's own conversion fails for 0e300; the other events never
+  // occur.
   bool Int(int) { return false; }
   bool Uint(unsigned) { return false; }
   bool Int64(std::int64_t) { return false; }
@@ -57,7 +58,7 @@ class Handler {
     return isText({text, length});
   }
   bool EndObject(rapidjson::SizeType) {
-    // Repeated keys are one before the meaning is looked for.
+    // Repeated keys are merged before the special keys are looked for.
     Dictionary dictionary = Dictionary::fromEntries(std::move(_open.back().entries));
     _open.pop_back();
     if (dictionary.size() != 1) return add(std::move(dictionary));
@@ -90,7 +91,7 @@ class Handler {
     std::string key;
   };
 
-  // RapidJSON lets the second half of a surrogate pair pass without its first.
+  // RapidJSON accepts the second half of a surrogate pair without the first.
   bool isText(std::string_view text) { return isUTF8(text) || fail("half of a surrogate pair"); }
   bool fail(std::string what) {
     _failure = std::move(what);
@@ -101,7 +102,7 @@ class Handler {
     _open.push_back({isDictionary, {}, {}, {}});
     return true;
   }
-  // Not inline: GCC 12 sees uninitialised members in moved values otherwise.
+  // If it were inline, GCC 12 would warn about uninitialised members of moved values.
   [[gnu::noinline]] bool add(Value value) {
     if (_open.empty()) {
       _value = std::move(value);
@@ -118,11 +119,11 @@ class Handler {
   std::string _failure;
 };
 
-}  // namespace
+constexpr unsigned kStrict = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag |
+                             rapidjson::kParseNumbersAsStringsFlag;
 
-Result<Value, JSONError> parseJSON(std::string_view text) {
-  constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag |
-                              rapidjson::kParseNumbersAsStringsFlag;
+template <unsigned kFlags>
+Result<Value, JSONError> parse(std::string_view text) {
   Handler handler;
   rapidjson::Reader reader;
   rapidjson::MemoryStream stream(text.data(), text.size());
@@ -132,11 +133,21 @@ Result<Value, JSONError> parseJSON(std::string_view text) {
     return Failure{
         JSONError{result.Offset(), failure.empty() ? rapidjson::GetParseError_En(result.Code()) : failure}};
   }
-  // The stream takes a zero byte for its end.
+  // The stream ends at a zero byte.
   if (stream.Tell() != text.size()) {
     return Failure{JSONError{stream.Tell(), "more text after the value"}};
   }
   return std::move(*handler.takeValue());
+}
+
+}  // namespace
+
+Result<Value, JSONError> parseJSON(std::string_view text) {
+  return parse<kStrict>(text);
+}
+
+Result<Value, JSONError> parseJSONWithComments(std::string_view text) {
+  return parse<kStrict | rapidjson::kParseCommentsFlag>(text);
 }
 
 }  // namespace veltrad::formats

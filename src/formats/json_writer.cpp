@@ -1,4 +1,4 @@
-// Writes JSON with RapidJSON's writers straight into a string. Any thread.
+// Writes JSON with RapidJSON's writers directly into a string.
 #include <rapidjson/prettywriter.h>
 #include <rapidjson/writer.h>
 
@@ -14,7 +14,7 @@ namespace veltrad::formats {
 
 namespace {
 
-// A stream as RapidJSON wants it, over a string.
+// A RapidJSON stream that appends to a string.
 class StringStream {
  public:
   using Ch = char;
@@ -26,7 +26,7 @@ class StringStream {
   std::string& _out;
 };
 
-// The same that keeps the beginning alone.
+// A RapidJSON stream that keeps the first bytes and counts the others.
 class ExcerptStream {
  public:
   using Ch = char;
@@ -146,14 +146,14 @@ constexpr bool hasZeroByte(std::uint64_t word) {
   return ((word - eachByte(0x01)) & ~word & eachByte(0x80)) != 0;
 }
 
-// True when each of the eight characters stands for itself: printable ASCII, no quote, no backslash.
+// True if none of the eight characters needs an escape: printable ASCII, no quote, no backslash.
 bool isPlain(std::uint64_t word) {
   const bool controls = ((word - eachByte(0x20)) & ~word & eachByte(0x80)) != 0;
   return (word & eachByte(0x80)) == 0 && !controls && !hasZeroByte(word ^ eachByte('"')) &&
          !hasZeroByte(word ^ eachByte('\\'));
 }
 
-// Beside the characters themselves: a control character may become six, a byte that is no UTF-8 three.
+// The bytes that escaping may add: a control character may become six bytes, an invalid byte three.
 std::size_t escapesAtMost(std::string_view text) {
   std::size_t more = 0;
   for (const char c : text) {
@@ -163,7 +163,7 @@ std::size_t escapesAtMost(std::string_view text) {
   return more;
 }
 
-// With its quotes. Most texts are plain, and eight characters at a time tell so.
+// With its quotes. Tests eight characters at a time, since most texts need no escapes.
 std::size_t textBytesAtMost(std::string_view text) {
   std::size_t bytes = text.size() + 2;
   for (std::size_t at = 0; at < text.size(); at += sizeof(std::uint64_t)) {

@@ -1,4 +1,4 @@
-// Tells the two forms of property lists apart.
+// Distinguishes the two forms of property lists.
 #include "formats/property_list.h"
 
 namespace veltrad::formats {

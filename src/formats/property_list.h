@@ -1,5 +1,4 @@
-// XML property lists (document type "plist" version 1.0), both directions, and lists of either form. Pure
-// functions from bytes to values and back.
+// Reads and writes XML property lists (document type "plist", version 1.0), and reads lists of either form.
 #pragma once
 
 #include <string>
@@ -9,13 +8,13 @@
 
 namespace veltrad::formats {
 
-// Either form, told apart by the first bytes.
+// Reads either form, which the first bytes tell.
 Result<Value, PropertyListError> parsePropertyList(std::string_view bytes,
                                                    const PropertyListLimits& limits = {});
 Result<Value, PropertyListError> parseXMLPropertyList(std::string_view bytes,
                                                       const PropertyListLimits& limits = {});
-// Characters that XML cannot hold become U+FFFD; dates are rounded down to whole seconds and kept within the
-// years 0 to 9999.
+// Characters that XML cannot represent become U+FFFD. Dates are rounded down to whole seconds and limited to
+// the years 0 to 9999.
 std::string writeXMLPropertyList(const Value& value);
 
 }  // namespace veltrad::formats

@@ -1,4 +1,4 @@
-// Reads XML property lists that nobody vouches for: Expat over one bounded buffer. Any thread.
+// Reads XML property lists from untrusted bytes, with Expat over one bounded buffer.
 #include <expat.h>
 #include <fmt/format.h>
 #include <malloc.h>
@@ -8,6 +8,7 @@
 #include <memory>
 
 #include "base/base64.h"
+#include "base/text.h"
 #include "formats/property_list.h"
 #include "formats/property_list_xml_scalars.h"
 
@@ -33,22 +34,37 @@ Element elementNamed(std::string_view name) {
   return Element::unknown;
 }
 
-// A byte order mark, blanks, then markup. In UTF-16 a mark is enough.
+// What the text of a leaf element must be.
+const char* expectedIn(Element leaf) {
+  switch (leaf) {
+    case Element::integer:
+      return "an integer of 64 bits";
+    case Element::real:
+      return "a real";
+    case Element::date:
+      return "a date like 2001-01-01T00:00:00Z";
+    case Element::data:
+      return "base64";
+    default:
+      return "an empty element";
+  }
+}
+
+// True for markup after an optional byte order mark and blanks. For UTF-16, the mark is enough.
 bool looksLikeXML(std::string_view bytes) {
   if (bytes.starts_with("\xFE\xFF") || bytes.starts_with("\xFF\xFE")) return true;
   if (bytes.starts_with("\xEF\xBB\xBF")) bytes.remove_prefix(3);
-  return withoutBlanks(bytes).starts_with('<');
+  return trimmed(bytes).starts_with('<');
 }
 
-// What the parser may hold, beside the values made: its copy of the list, and tags. Without it a start tag
-// full of attributes takes 17 times its length. Expat hands its allocator no argument, hence the thread's own
-// pointer; it is set while a Reader lives, and readers do not nest.
+// Limits the memory of the parser, which does not include the values made. Without a limit, a start tag full
+// of attributes takes 17 times its length. Expat passes no argument to its allocator, hence the thread-local
+// pointer; it is set while a Reader exists, and readers do not nest.
 class ParserMemory {
  public:
   explicit ParserMemory(std::size_t limit) : _limit(limit) { current = this; }
   ~ParserMemory() { current = nullptr; }
   ParserMemory(const ParserMemory&) = delete;
-  ParserMemory& operator=(const ParserMemory&) = delete;
 
   static const XML_Memory_Handling_Suite* suite() {
     static constexpr XML_Memory_Handling_Suite kSuite = {
@@ -78,7 +94,7 @@ class ParserMemory {
 };
 thread_local ParserMemory* ParserMemory::current = nullptr;
 
-// Reads one list. On the caller's stack; the bytes outlive it.
+// Reads one list.
 class Reader {
  public:
   Reader(std::size_t bytes, const PropertyListLimits& limits)
@@ -96,20 +112,21 @@ class Reader {
     bool isDictionary;
     Array array;
     std::vector<Dictionary::Entry> entries;
-    std::optional<std::string> key;  // read, its value still to come
+    // Read, but its value has not been read yet.
+    std::optional<std::string> key;
   };
 
   void setHandlers();
   static Reader& from(void* self) { return *static_cast<Reader*>(self); }
 
-  // Notes the first error and stops the parser.
+  // Keeps the first error and stops the parser.
   void fail(Kind kind, std::string_view what);
   bool failed() const { return _error.has_value(); }
 
   void begin(std::string_view name, const XML_Char** attributes);
   void beginPlist(Element element, std::string_view name, const XML_Char** attributes);
   bool mayStandHere(Element element, std::string_view name);
-  bool chargeObject();
+  bool chargeText(std::size_t bytes);
   void end();
   void characters(std::string_view text);
 
@@ -125,8 +142,9 @@ class Reader {
   std::size_t _textLeft;
   const std::size_t _depthLimit;
   bool _inPlist = false;
-  std::optional<Element> _leaf;  // the leaf element that is being read
-  std::string _text;             // its text so far
+  // The leaf element that is being read, and its text so far.
+  std::optional<Element> _leaf;
+  std::string _text;
   std::vector<Open> _open;
   std::optional<Value> _value;
   std::optional<PropertyListError> _error;
@@ -166,7 +184,7 @@ void Reader::setHandlers() {
                                       const XML_Char*, const XML_Char*, const XML_Char*) {
     from(self).fail(Kind::forbidden, "an entity declaration");
   });
-  // An entity that the external subset may declare, which is never fetched.
+  // Entities may be declared in the external subset, which is never fetched.
   XML_SetSkippedEntityHandler(parser, [](void* self, const XML_Char* name, int) {
     from(self).fail(Kind::forbidden, fmt::format("a reference to the entity \"{:.40}\"", name));
   });
@@ -179,7 +197,9 @@ void Reader::setHandlers() {
 
 void Reader::fail(Kind kind, std::string_view what) {
   if (failed()) return;
-  _error = {kind, fmt::format("line {}: {}", XML_GetCurrentLineNumber(_parser.get()), what)};
+  const TextPlace place{XML_GetCurrentLineNumber(_parser.get()),
+                        XML_GetCurrentColumnNumber(_parser.get()) + 1};
+  _error = {kind, std::string(what), place};
   XML_StopParser(_parser.get(), XML_FALSE);
 }
 
@@ -187,7 +207,9 @@ void Reader::begin(std::string_view name, const XML_Char** attributes) {
   if (failed()) return;
   const Element element = elementNamed(name);
   if (!_inPlist) return beginPlist(element, name, attributes);
-  if (!mayStandHere(element, name) || !chargeObject()) return;
+  if (!mayStandHere(element, name)) return;
+  if (_objectsLeft == 0) return fail(Kind::tooLarge, "more objects than the limit");
+  --_objectsLeft;
   if (element != Element::dict && element != Element::array) {
     _leaf = element;
     _text.clear();
@@ -231,12 +253,12 @@ bool Reader::mayStandHere(Element element, std::string_view name) {
   return false;
 }
 
-bool Reader::chargeObject() {
-  if (_objectsLeft == 0) {
-    fail(Kind::tooLarge, "more objects than the limit");
+bool Reader::chargeText(std::size_t bytes) {
+  if (bytes > _textLeft) {
+    fail(Kind::tooLarge, "more bytes of texts and data than the limit");
     return false;
   }
-  --_objectsLeft;
+  _textLeft -= bytes;
   return true;
 }
 
@@ -252,14 +274,11 @@ void Reader::end() {
 void Reader::characters(std::string_view text) {
   if (failed()) return;
   if (!_leaf) {
-    if (!withoutBlanks(text).empty()) fail(Kind::malformed, "text between the elements");
+    if (!trimmed(text).empty()) fail(Kind::malformed, "text between the elements");
     return;
   }
-  if ((*_leaf == Element::string || *_leaf == Element::key)) {
-    if (text.size() > _textLeft) return fail(Kind::tooLarge, "more bytes of texts and data than the limit");
-    _textLeft -= text.size();
-  }
-  _text.append(text);
+  const bool kept = *_leaf == Element::string || *_leaf == Element::key;
+  if (!kept || chargeText(text.size())) _text.append(text);
 }
 
 void Reader::finishLeaf() {
@@ -271,19 +290,8 @@ void Reader::finishLeaf() {
   auto value = leafValue();
   if (failed()) return;
   if (!value) {
-    constexpr const char* kExpected[] = {"",
-                                         "",
-                                         "",
-                                         "",
-                                         "",
-                                         "an integer of 64 bits",
-                                         "a real",
-                                         "an empty element",
-                                         "an empty element",
-                                         "a date like 2001-01-01T00:00:00Z",
-                                         "base64"};
-    return fail(Kind::malformed, fmt::format("\"{:.40}\" where {} is expected", withoutBlanks(_text),
-                                             kExpected[static_cast<std::size_t>(*_leaf)]));
+    return fail(Kind::malformed,
+                fmt::format("\"{:.40}\" where {} is expected", trimmed(_text), expectedIn(*_leaf)));
   }
   _leaf.reset();
   add(std::move(*value));
@@ -295,34 +303,25 @@ std::optional<Value> Reader::leafValue() {
       return Value(std::move(_text));
     case Element::integer:
       return parseInteger(_text);
-    case Element::real: {
-      const auto number = parseReal(_text);
-      return number ? std::optional<Value>(*number) : std::nullopt;
-    }
+    case Element::real:
+      return parseReal(_text);
     case Element::true_:
     case Element::false_:
-      return withoutBlanks(_text).empty() ? std::optional<Value>(*_leaf == Element::true_) : std::nullopt;
-    case Element::date: {
-      const auto date = parseDate(_text);
-      return date ? std::optional<Value>(*date) : std::nullopt;
-    }
+      return trimmed(_text).empty() ? std::optional<Value>(*_leaf == Element::true_) : std::nullopt;
+    case Element::date:
+      return parseDate(_text);
     default:
       return dataValue();
   }
 }
 
 std::optional<Value> Reader::dataValue() {
-  // The decoder skips whatever is no base64; here blanks alone may be skipped.
+  // The decoder skips all other characters; here only blanks may be skipped.
   constexpr std::string_view kAllowed =
       "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/= \t\r\n";
   if (_text.find_first_not_of(kAllowed) != std::string::npos) return std::nullopt;
   auto bytes = decodeBase64(_text);
-  if (!bytes) return std::nullopt;
-  if (bytes->size() > _textLeft) {
-    fail(Kind::tooLarge, "more bytes of texts and data than the limit");
-    return std::nullopt;
-  }
-  _textLeft -= bytes->size();
+  if (!bytes || !chargeText(bytes->size())) return std::nullopt;
   return Value(Data{std::move(*bytes)});
 }
 

@@ -1,4 +1,4 @@
-// Numbers and dates of XML property lists by std::from_chars and std::chrono's calendar. Any thread.
+// Numbers and dates of XML property lists, with std::from_chars and the calendar of std::chrono.
 #include "formats/property_list_xml_scalars.h"
 
 #include <fmt/format.h>
@@ -8,6 +8,8 @@
 #include <cmath>
 #include <limits>
 
+#include "base/text.h"
+
 namespace veltrad::formats::xml_property_list {
 
 namespace {
@@ -15,7 +17,7 @@ namespace {
 constexpr double kFirstSecond = -62'167'219'200;  // 0000-01-01T00:00:00Z
 constexpr double kLastSecond = 253'402'300'799;   // 9999-12-31T23:59:59Z
 
-// True when a sign was there and is gone.
+// True if there was a sign, which is then removed.
 bool takeSign(std::string_view& text, bool& negative) {
   negative = text.starts_with('-');
   if (!negative && !text.starts_with('+')) return false;
@@ -23,7 +25,7 @@ bool takeSign(std::string_view& text, bool& negative) {
   return true;
 }
 
-// Digits alone, exactly as many as the field is wide.
+// Exactly `width` digits.
 bool takeField(std::string_view text, std::size_t at, std::size_t width, unsigned& field) {
   field = 0;
   for (const char c : text.substr(at, width)) {
@@ -35,15 +37,8 @@ bool takeField(std::string_view text, std::size_t at, std::size_t width, unsigne
 
 }  // namespace
 
-std::string_view withoutBlanks(std::string_view text) {
-  constexpr std::string_view kBlanks = " \t\r\n";
-  const std::size_t first = text.find_first_not_of(kBlanks);
-  if (first == std::string_view::npos) return {};
-  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
-}
-
 std::optional<Value> parseInteger(std::string_view text) {
-  text = withoutBlanks(text);
+  text = trimmed(text);
   bool negative = false;
   takeSign(text, negative);
   int base = 10;
@@ -63,8 +58,8 @@ std::optional<Value> parseInteger(std::string_view text) {
   return Value(static_cast<std::int64_t>(magnitude));
 }
 
-std::optional<double> parseReal(std::string_view text) {
-  text = withoutBlanks(text);
+std::optional<Value> parseReal(std::string_view text) {
+  text = trimmed(text);
   bool negative = false;
   if (takeSign(text, negative) && (text.starts_with('-') || text.starts_with('+'))) return std::nullopt;
   double number = 0;
@@ -73,8 +68,8 @@ std::optional<double> parseReal(std::string_view text) {
   return negative ? -number : number;
 }
 
-std::optional<Date> parseDate(std::string_view text) {
-  text = withoutBlanks(text);
+std::optional<Value> parseDate(std::string_view text) {
+  text = trimmed(text);
   constexpr std::string_view kShape = "0000-00-00T00:00:00Z";
   if (text.size() != kShape.size()) return std::nullopt;
   for (std::size_t i = 0; i < kShape.size(); ++i) {

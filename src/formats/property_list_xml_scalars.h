@@ -1,4 +1,4 @@
-// The texts of XML property lists' leaf elements: numbers, dates. Locale plays no part. Any thread.
+// The texts of numbers and dates in XML property lists, independent of the locale.
 #pragma once
 
 #include <optional>
@@ -9,16 +9,15 @@
 
 namespace veltrad::formats::xml_property_list {
 
-std::string_view withoutBlanks(std::string_view text);
+// The parsers ignore blanks around the text, and return nothing if it is not valid.
 
-// Blanks around a number or date are ignored. Nothing: the text is none.
-// Decimal or 0x and hexadecimal, with a sign or without, within 64 bits of either kind.
+// Decimal, or hexadecimal after 0x, with an optional sign; within 64 bits, signed or unsigned.
 std::optional<Value> parseInteger(std::string_view text);
-// Decimal with or without exponent, or nan, inf, infinity in any letter case; a sign or none.
-std::optional<double> parseReal(std::string_view text);
+// Decimal with an optional exponent, or nan, inf or infinity in any letter case; with an optional sign.
+std::optional<Value> parseReal(std::string_view text);
 // YYYY-MM-DDTHH:MM:SSZ
-std::optional<Date> parseDate(std::string_view text);
-// Whole seconds, rounded down; what lies outside the years 0 to 9999 becomes the nearest second inside.
+std::optional<Value> parseDate(std::string_view text);
+// Rounded down to whole seconds, and limited to the years 0 to 9999.
 std::string dateText(Date date);
 
 }  // namespace veltrad::formats::xml_property_list

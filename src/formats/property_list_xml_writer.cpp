@@ -1,4 +1,4 @@
-// Writes XML property lists, indented by tabs, in UTF-8. Any thread.
+// Writes XML property lists in UTF-8, indented by tabs.
 #include <fmt/format.h>
 
 #include "base/base64.h"
@@ -10,7 +10,7 @@ namespace veltrad::formats {
 
 namespace {
 
-// XML has no way to write these: they become U+FFFD, as do bytes that are no UTF-8.
+// False for characters that XML cannot represent and for bytes that are not valid UTF-8: they become U+FFFD.
 bool isWritable(const UTF8Character& character) {
   if (character.length == 0) return false;
   const char32_t code = character.code;
@@ -85,7 +85,7 @@ class Writer {
       case '>':
         _out += "&gt;";
         break;
-      case '\r':  // a reader makes a line feed of a bare one
+      case '\r':  // a reader would replace a bare one by a line feed
         _out += "&#13;";
         break;
       default:

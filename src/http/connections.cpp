@@ -1,4 +1,4 @@
-// The sockets of libcurl's connections, and whom these trust.
+// The sockets of libcurl's connections, and the certificates that they trust.
 #include "http/connections.h"
 
 #include <netinet/in.h>
@@ -35,7 +35,7 @@ bool somethingWaits(curl_socket_t socket) {
   return length >= 0 || (errno != EAGAIN && errno != EWOULDBLOCK && errno != EINTR);
 }
 
-// Empties the queue. OpenSSL files what the system said under the number that errno had.
+// Empties OpenSSL's error queue. The reason of a system error is the errno.
 bool shortageInErrorQueue() {
   bool found = false;
   while (const unsigned long error = ERR_get_error()) {
@@ -60,8 +60,6 @@ void Connections::Free::operator()(X509_STORE* store) const {
 Connections::Connections(std::string extraCertificatesPath)
     : _extraCertificatesPath(std::move(extraCertificatesPath)) {}
 
-Connections::~Connections() = default;
-
 curl_socket_t Connections::open(const curl_sockaddr& address) {
   try {
     _sockets.reserve(_sockets.size() + 1);
@@ -81,15 +79,15 @@ int Connections::close(void* self, curl_socket_t socket) {
 }
 
 bool Connections::ended(int localPort) const {
-  // Connections to different servers may share a local port; in doubt a new one is made.
+  // Connections to different servers may share a local port. This may then report a live connection as ended,
+  // which only costs a new one.
   return std::any_of(_sockets.begin(), _sockets.end(), [localPort](curl_socket_t socket) {
     return localPortOf(socket) == localPort && somethingWaits(socket);
   });
 }
 
 X509_STORE* Connections::trusted() {
-  const std::optional<Stamp> now =
-      stampNow();  // before the reading: a file that changes meanwhile is read again
+  const std::optional<Stamp> now = stampNow();  // first, so that a file that changes meanwhile is read again
   if (now && (!_store || !(*now == _stamp))) {
     if (Store fresh = makeStore(now->size >= 0)) {
       _store = std::move(fresh);
@@ -111,10 +109,10 @@ Connections::Store Connections::makeStore(bool withExtra) const {
   ERR_clear_error();
   Store store(X509_STORE_new());
   if (!store) return store;
-  // As libcurl sets them: a trusted certificate ends the chain, whoever issued it.
+  // The same flags as libcurl sets: a trusted certificate ends the chain, whoever issued it.
   X509_STORE_set_flags(store.get(), X509_V_FLAG_TRUSTED_FIRST | X509_V_FLAG_PARTIAL_CHAIN);
   X509_STORE_load_path(store.get(), X509_get_default_cert_dir());
-  const char* bundle = X509_get_default_cert_file();  // not every system has one beside its directory
+  const char* bundle = X509_get_default_cert_file();  // does not exist on every system
   if (access(bundle, R_OK) == 0) X509_STORE_load_file(store.get(), bundle);
   if (shortageInErrorQueue()) return nullptr;
   if (!withExtra || X509_STORE_load_file(store.get(), _extraCertificatesPath.c_str()) == 1) return store;

@@ -1,5 +1,4 @@
-// What HTTPS connections are made with: sockets that can be asked whether their server has gone, and the
-// certificate authorities that are trusted. HTTP thread.
+// The sockets and the trusted certificate authorities of HTTPS connections. HTTP thread.
 #pragma once
 
 #include <curl/curl.h>
@@ -10,37 +9,33 @@
 #include <string>
 #include <vector>
 
-// OpenSSL's own names, so that its headers stay in the body.
+// As in OpenSSL's headers.
 using X509_STORE = struct x509_store_st;
 
 namespace veltrad::http {
 
-// One thread only; outlives the connections.
+// Must outlive the connections.
 //
-// Trusted are the system's authorities and those of an extra PEM file. One store serves every connection: the
-// system's directory is looked into by need, so making a connection loads nothing. The extra file is read
-// again when its stamp has changed. A store that lacks something for a shortage is never used: the last whole
-// one serves, and the next question tries again.
+// Trusts the system's authorities and those of an extra PEM file. All connections share one store, which
+// looks into the system's directory on demand, so a new connection loads nothing. The extra file is read
+// again when it has changed. A store that is incomplete because of a shortage is never used: the last
+// complete one stays in use, and the next call tries again.
 class Connections {
  public:
-  // Empty or no such file: the system's authorities alone.
+  // The path may be empty, and the file may be missing.
   explicit Connections(std::string extraCertificatesPath);
-  ~Connections();
   Connections(const Connections&) = delete;
-  Connections& operator=(const Connections&) = delete;
 
-  // Close-on-exec; CURL_SOCKET_BAD with errno.
+  // Close-on-exec; CURL_SOCKET_BAD with errno on failure.
   curl_socket_t open(const curl_sockaddr& address);
   // For CURLOPT_CLOSESOCKETFUNCTION; `self` is a Connections.
   static int close(void* self, curl_socket_t socket);
-  // Whether something waits to be read, the end included, on the connection from this local port. libcurl
-  // takes a TLS connection that its server has closed for a live one, since the closing alert is waiting
-  // data to it: a post sent there would be lost. Before a request is sent, nothing that its server says
-  // there can be an answer.
+  // True if there is data, or the end, to be read on the connection from this local port. Before a request is
+  // sent, this can only mean that the server has closed the connection. libcurl takes the alert that closes a
+  // TLS connection for data and the connection for live, so a post sent on it would be lost.
   bool ended(int localPort) const;
 
-  // Null when there is none for now: no memory, or a file that could not be read for a shortage. Lives until
-  // the next call.
+  // Null if there is no complete store because of a shortage. Valid until the next call.
   X509_STORE* trusted();
 
  private:
@@ -56,9 +51,9 @@ class Connections {
   };
   using Store = std::unique_ptr<X509_STORE, Free>;
 
-  // Nothing: it cannot be looked at just now.
+  // Absent during a shortage.
   std::optional<Stamp> stampNow() const;
-  // Null: for now it cannot be had whole.
+  // Null if it would be incomplete because of a shortage.
   Store makeStore(bool withExtra) const;
 
   std::vector<curl_socket_t> _sockets;

@@ -1,4 +1,4 @@
-// The rules for libcurl: what is switched off, what is bounded, what is verified. HTTP thread.
+// The settings of libcurl for a transfer, and its callbacks.
 #include "http/curl_transfer.h"
 
 #include <openssl/ssl.h>
@@ -19,12 +19,13 @@ namespace veltrad::http {
 
 namespace {
 
-constexpr std::string_view kNoResolverThread = "getaddrinfo() thread failed to start";  // libcurl's text
-constexpr std::string_view kResolvingTimedOut = "Resolving timed out";                  // likewise
+// libcurl's texts.
+constexpr std::string_view kNoResolverThread = "getaddrinfo() thread failed to start";
+constexpr std::string_view kResolvingTimedOut = "Resolving timed out";
 constexpr long kConnectSeconds = 10;
 constexpr long kLowSpeedSeconds = 60;
 constexpr std::size_t kMostHeaderBytes = 64u << 10;
-constexpr std::size_t kMostHeaderLines = 256;  // libcurl's own work on them grows with the square
+constexpr std::size_t kMostHeaderLines = 256;  // libcurl's time is quadratic in them
 
 bool isControl(char c) {
   return static_cast<unsigned char>(c) < 0x20 || c == 0x7f;
@@ -37,7 +38,7 @@ std::string_view trimmed(std::string_view text) {
   return text;
 }
 
-// A token of RFC 9110, 5.6.2.
+// A token (RFC 9110, 5.6.2).
 bool isToken(std::string_view name) {
   const auto allowed = [](char c) {
     const auto byte = static_cast<unsigned char>(c);
@@ -47,7 +48,7 @@ bool isToken(std::string_view name) {
   return !name.empty() && std::all_of(name.begin(), name.end(), allowed);
 }
 
-// "name: value" for libcurl, in whose notation an empty value is "name;".
+// "name: value", or "name;" for an empty value, as libcurl expects it.
 std::string headerLine(std::string_view name, std::string_view value) {
   std::string clean(value);
   clean.erase(std::remove_if(clean.begin(), clean.end(), isControl), clean.end());
@@ -56,7 +57,7 @@ std::string headerLine(std::string_view name, std::string_view value) {
   return clean.empty() ? line + ";" : line + ": " + clean;
 }
 
-// What stands between "//" and the path.
+// The part between "//" and the path.
 std::string hostOf(std::string_view url) {
   const std::size_t slashes = url.find("//");
   if (slashes != std::string_view::npos) url.remove_prefix(slashes + 2);
@@ -74,8 +75,8 @@ CURLcode setStore(CURL*, void* context, void* connections) {
   }
 }
 
-// Whether there are as many descriptors as libc and OpenSSL open while they resolve a name or look for a
-// certificate: neither says that it was this which it lacked.
+// True if fewer descriptors are left than libc and OpenSSL need to resolve a name or to find a certificate.
+// Their errors do not tell that descriptors were missing.
 bool descriptorsAreShort() {
   std::array<FileDescriptor, 4> some;
   return std::any_of(some.begin(), some.end(), [](FileDescriptor& one) {
@@ -86,7 +87,7 @@ bool descriptorsAreShort() {
 
 }  // namespace
 
-// curl_easy_setopt, and whether all of it was taken: an option that is missing may be one that protects.
+// Sets options and remembers whether all were accepted: a missing one may be a protection.
 class CurlTransfer::Options {
  public:
   explicit Options(CURL* easy) : _easy(easy) {}
@@ -122,9 +123,9 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_HTTP_VERSION, static_cast<long>(CURL_HTTP_VERSION_1_1));
   options.set(CURLOPT_FOLLOWLOCATION, 0L);
   options.set(CURLOPT_NETRC, static_cast<long>(CURL_NETRC_IGNORED));
-  options.set(CURLOPT_PROXY, "");  // nor one from the environment
+  options.set(CURLOPT_PROXY, "");  // ignores the environment, too
   options.set(CURLOPT_NOSIGNAL, 1L);
-  options.set(CURLOPT_QUICK_EXIT, 1L);  // a dead resolver must not hold the thread
+  options.set(CURLOPT_QUICK_EXIT, 1L);  // does not wait for a resolver that hangs
   options.set(CURLOPT_OPENSOCKETFUNCTION, openSocket);
   options.set(CURLOPT_OPENSOCKETDATA, this);
   options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
@@ -144,9 +145,9 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_SSLVERSION, static_cast<long>(CURL_SSLVERSION_TLSv1_2));
   options.set(CURLOPT_SSL_VERIFYPEER, 1L);
   options.set(CURLOPT_SSL_VERIFYHOST, 2L);
-  options.set(CURLOPT_SSL_SESSIONID_CACHE, 0L);  // every connection has its certificate checked
-  // The shared store alone: libcurl would load its own for each connection, and its cache would keep ours
-  // when it has been replaced.
+  options.set(CURLOPT_SSL_SESSIONID_CACHE, 0L);  // checks the certificate of every connection
+  // Only the shared store is used: libcurl would load one for each connection, and cache ours after it was
+  // replaced.
   options.set(CURLOPT_CA_CACHE_TIMEOUT, 0L);
   options.set(CURLOPT_CAINFO, static_cast<char*>(nullptr));
   options.set(CURLOPT_CAPATH, static_cast<char*>(nullptr));
@@ -157,9 +158,9 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
 
 bool CurlTransfer::setHeaders() {
   _headerList.reset();
-  // What libcurl would add by itself, unless the request has its own.
+  // Headers that libcurl would add unless the request has them.
   std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
-  bool lengthSaid = false;  // in its place among the others; what the request says of it does not count
+  bool lengthSaid = false;  // the request's own Content-Length only sets its position
   const auto append = [this](const std::string& line) {
     curl_slist* longer = curl_slist_append(_headerList.get(), line.c_str());
     if (longer == nullptr) return false;
@@ -190,7 +191,7 @@ void CurlTransfer::setBody(Options& options) {
   options.set(CURLOPT_POST, 1L);
   options.set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_bodySize));
   if (!_request.fileBody) return options.set(CURLOPT_POSTFIELDS, _request.body.data());  // not copied
-  // Without a function to seek in it: it is not sent twice.
+  // Without a seek function, because it is never sent twice.
   _sent = 0;
   options.set(CURLOPT_READFUNCTION, giveBody);
   options.set(CURLOPT_READDATA, this);
@@ -220,8 +221,8 @@ curl_socket_t CurlTransfer::openSocket(void* self, curlsocktype, curl_sockaddr* 
   return made;
 }
 
-// Not on a kept connection that has ended. And not again: libcurl repeats a request when a kept connection
-// ends without a byte; the server may have read it all the same, and a post is never sent twice.
+// Aborts on a kept connection that has ended. Also aborts a repeated post: libcurl repeats a request if a
+// kept connection ends without an answer, but the server may have read it, and a post must not be sent twice.
 int CurlTransfer::beforeRequest(void* self, char*, char*, int, int localPort) {
   auto& transfer = *static_cast<CurlTransfer*>(self);
   if (transfer._attempts > 0 && transfer._request.method == HTTPRequest::Method::post)
@@ -243,10 +244,10 @@ void CurlTransfer::setLimits(Options& options, Time now) {
   }
   if (!_deadline) _deadline = now + _request.timeout;
   const auto left = std::chrono::ceil<std::chrono::milliseconds>(*_deadline - now).count();
-  options.set(CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would be no limit at all
+  options.set(CURLOPT_TIMEOUT_MS, std::max<long>(1, left));  // 0 would mean no limit
 }
 
-// False: memory is short. An answer that nobody keeps is thrown away.
+// Runs `piece` if the answer is kept. False if memory is short.
 template <typename Piece>
 bool CurlTransfer::collects(const Piece& piece) {
   try {
@@ -260,12 +261,12 @@ bool CurlTransfer::collects(const Piece& piece) {
 std::size_t CurlTransfer::takeBody(char* bytes, std::size_t size, std::size_t count, void* self) {
   auto& transfer = *static_cast<CurlTransfer*>(self);
   const std::size_t length = size * count;
-  transfer._received += length;  // far below overflow: libcurl hands over some hundred KiB at most
+  transfer._received += length;
   if (transfer.answerTooLarge()) return CURL_WRITEFUNC_ERROR;
   return transfer.collects([&] { transfer._body.append(bytes, length); }) ? length : CURL_WRITEFUNC_ERROR;
 }
 
-// Line by line, those of interim answers and trailers too.
+// Called for each line, those of interim answers and trailers included.
 std::size_t CurlTransfer::takeHeader(char* bytes, std::size_t size, std::size_t count, void* self) {
   auto& transfer = *static_cast<CurlTransfer*>(self);
   const std::size_t length = size * count;
@@ -278,7 +279,7 @@ std::size_t CurlTransfer::takeHeader(char* bytes, std::size_t size, std::size_t 
 void CurlTransfer::collectHeader(std::string_view line) {
   const bool continues = line.front() == ' ' || line.front() == '\t';
   line = trimmed(line);
-  if (_headersEnded && line.starts_with("HTTP/")) {  // else a trailer, which nobody reads
+  if (_headersEnded && line.starts_with("HTTP/")) {  // otherwise a trailer, which is ignored
     _headersEnded = false;
     _headers.clear();
   } else if (line.empty() && !continues) {
@@ -343,7 +344,7 @@ std::string CurlTransfer::describe(CURLcode code) const {
     return std::string("The file to send cannot be read as far as it should: ") + strerrordesc_np(_bodyError);
   if (_socketError != 0) return std::string("No socket can be opened: ") + strerrordesc_np(_socketError);
   if (code == CURLE_ABORTED_BY_CALLBACK)
-    return "Empty reply from server";  // as libcurl says on a new connection
+    return "Empty reply from server";  // libcurl's text for a new connection
   std::string text = _error[0] != '\0' ? _error.data() : curl_easy_strerror(code);
   while (!text.empty() && isControl(text.back())) text.pop_back();
   std::replace_if(text.begin(), text.end(), isControl, ' ');

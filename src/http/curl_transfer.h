@@ -1,5 +1,4 @@
-// One HTTPS exchange: its request, how libcurl is set up for it, and what came back. HTTP thread once it is
-// filed.
+// One HTTPS exchange: its request, the settings of libcurl, and the answer.
 #pragma once
 
 #include <curl/curl.h>
@@ -16,45 +15,45 @@
 
 namespace veltrad::http {
 
-// Made on the caller's thread, then the HTTP thread's alone. While an easy handle is attached, `connections`
-// must live. Its 24 fields are the request, what libcurl is given, and the answer as it comes.
+// Constructed on the caller's thread, then used only on the HTTP thread. `connections` must exist while an
+// easy handle is attached. Its 24 fields are the request, what libcurl is given, and the answer as it
+// arrives.
 class CurlTransfer {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
   CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool blocking, Time now);
   CurlTransfer(const CurlTransfer&) = delete;
-  CurlTransfer& operator=(const CurlTransfer&) = delete;
 
   HTTPRequest::Lane lane() const { return _request.lane; }
-  const std::string& host() const {
-    return _host;
-  }  // "name:port" as the URL has it: what connections are counted by
+  // "name:port" as in the URL: connections are counted by it.
+  const std::string& host() const { return _host; }
   std::uintptr_t sequence() const { return _request.sequence; }
   Time arrived() const { return _arrived; }
-  bool blocking() const { return _blocking; }  // somebody waits in perform()
+  // True if a thread waits in perform().
+  bool blocking() const { return _blocking; }
   bool expired(Time now) const { return _deadline && *_deadline <= now; }
 
-  // Sets `easy` up, which is fresh or reset. False, or std::bad_alloc: there is no memory for it.
+  // Sets up `easy`, which is new or was reset. False, or std::bad_alloc, if there is no memory for it.
   bool attach(CURL* easy, Connections& connections, Time now);
-  CURL* easy() const { return _easy; }  // the one attached last
-  // The kept connection that libcurl chose had ended, so nothing was sent: attach again, once; it then gets a
-  // new one.
+  // The handle that was attached last.
+  CURL* easy() const { return _easy; }
+  // True if libcurl chose a kept connection that had ended, so that nothing was sent. Attach it again, once,
+  // for a new connection.
   bool metEndedConnection() const { return _connection == Connection::ended; }
-  // What libcurl's verdict means; reads the attached handle.
+  // The result for libcurl's code; reads the attached handle.
   HTTPResult result(CURLcode code);
   HTTPResult timedOutWaiting() const;
   static HTTPError stopping() { return {HTTPError::Kind::stopping, "The daemon is stopping"}; }
-  static HTTPError outOfMemory() {
-    return {HTTPError::Kind::shortage, "Out of memory"};
-  }  // allocates nothing
+  // Does not allocate.
+  static HTTPError outOfMemory() { return {HTTPError::Kind::shortage, "Out of memory"}; }
 
-  // Once, without any lock; lets the completion go. What the request keeps, and its charge, go with the
-  // object.
+  // Runs the completion and destroys it. To be called once, without holding a lock.
   void complete(HTTPResult result);
 
  private:
-  enum class Connection { kept, ended, own };  // as far as is known: `own` once it has opened one
+  // own: the transfer has opened a connection.
+  enum class Connection { kept, ended, own };
   using HeaderList = std::unique_ptr<curl_slist, decltype(&::curl_slist_free_all)>;
 
   class Options;
@@ -82,28 +81,33 @@ class CurlTransfer {
   const std::string _host;
   const std::uint64_t _bodySize;
   const Time _arrived;
-  std::optional<Time> _deadline;  // of uploads and log data once they run; none: a least speed holds instead
+  // Absent while an upload or log data waits, and if a minimum speed holds instead.
+  std::optional<Time> _deadline;
 
   CURL* _easy = nullptr;
   Connections* _connections = nullptr;
   Connection _connection = Connection::kept;
   HeaderList _headerList{nullptr, curl_slist_free_all};
   std::array<char, CURL_ERROR_SIZE> _error{};
-  std::uint64_t _sent = 0;  // of the body's file
-  int _attempts = 0;        // how often libcurl was about to send the request
+  // Bytes of the body's file that were sent.
+  std::uint64_t _sent = 0;
+  // How often libcurl was about to send the request.
+  int _attempts = 0;
 
-  // What went wrong in a callback
-  int _socketError = 0;  // EMFILE and its like
+  // Failures of callbacks; the numbers are errnos.
+  int _socketError = 0;
   int _bodyError = 0;
   bool _memoryShort = false;
 
-  // The answer
+  // The answer.
   HTTPHeaders _headers;
-  bool _headersEnded = true;  // what comes next is a status line, or a trailer
+  // The next line is a status line or a trailer.
+  bool _headersEnded = true;
   std::size_t _headerBytes = 0;
   std::size_t _headerLines = 0;
   std::string _body;
-  std::size_t _received = 0;  // of the body
+  // Bytes of the body.
+  std::size_t _received = 0;
 };
 
 }  // namespace veltrad::http

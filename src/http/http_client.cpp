@@ -1,4 +1,4 @@
-// HTTPS requests: from any thread to the HTTP thread, and that thread's loop.
+// Passes requests from any thread to the HTTP thread, and runs that thread's loop.
 #include "http/http_client.h"
 
 #include <curl/curl.h>
@@ -30,7 +30,7 @@ std::optional<std::string_view> HTTPResponse::header(std::string_view name) cons
 }
 
 std::size_t keptBytes(const HTTPRequest& request) {
-  // The transfer, its place in the queues, and the two copies of each header.
+  // The transfer with its list entries, and the two copies of each header.
   constexpr std::size_t kTransfer = 1536, kCopies = 2, kHeader = 96;
   std::size_t bytes = kTransfer + 2 * request.url.capacity() + blockBytes(request.body.capacity());
   for (const auto& [name, value] : request.headers) {
@@ -39,8 +39,8 @@ std::size_t keptBytes(const HTTPRequest& request) {
   return bytes;
 }
 
-// The client's insides: what any thread calls, and the thread that runs libcurl's multi interface and every
-// completion. Memory that is short ends the transfer that needs it, not the thread.
+// Runs libcurl's multi interface and all completions on one thread. A lack of memory ends the transfer that
+// needs it, not the thread.
 struct CurlHTTPClient::Impl {
   using Transfers = HTTPQueue::Transfers;
   using Multi = std::unique_ptr<CURLM, decltype(&curl_multi_cleanup)>;
@@ -75,14 +75,15 @@ struct CurlHTTPClient::Impl {
 
   HTTPQueue queue;
   Mutex starting LEAF_LOCK{LockRank::leaf};
-  std::atomic<bool> started{false};  // after it `multi` and `thread` stay as they are
-  Connections connections;           // outlives the two that use it
+  // Once it is true, `multi` and `thread` do not change.
+  std::atomic<bool> started{false};
+  Connections connections;
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
   ServerRecords records;
 
   // HTTP thread only
-  std::vector<Easy> idleHandles;  // their set-up costs more than a reset
+  std::vector<Easy> idleHandles;  // making one costs more than resetting one
   Transfers running;
 };
 
@@ -102,14 +103,14 @@ Result<Done, HTTPError> CurlHTTPClient::Impl::file(HTTPRequest request, HTTPComp
   }
 }
 
-// Nothing of libcurl is touched before the first request. What was short is not remembered.
+// libcurl is not used before the first request. A failure is not remembered.
 Result<Done, HTTPError> CurlHTTPClient::Impl::startThread() {
   if (started.load(std::memory_order_acquire)) return Done();
   const Lock lock(starting);
   if (started.load(std::memory_order_relaxed)) return Done();
   const bool initialised = curl_global_init(CURL_GLOBAL_DEFAULT) == CURLE_OK;
   multi.reset(initialised ? curl_multi_init() : nullptr);
-  // Without descriptors it is made all the same, but nobody could wake it.
+  // Without descriptors it is made nevertheless, but could not be woken.
   if (!multi || curl_multi_wakeup(multi.get()) != CURLM_OK)
     return Failure{HTTPError{HTTPError::Kind::shortage, "libcurl has no memory or descriptors to begin"}};
   curl_multi_setopt(multi.get(), CURLMOPT_PIPELINING, CURLPIPE_NOTHING);
@@ -145,8 +146,8 @@ void CurlHTTPClient::Impl::run() {
     finish();
     endExpired();
     startNext();
-    if (orders.last) continue;  // until nothing is left, completions' own requests included
-    constexpr int kCheckWaiting = 50, kIdle = 3'600'000;  // ms; libcurl's own timers come first
+    if (orders.last) continue;  // until nothing is left, requests of completions included
+    constexpr int kCheckWaiting = 50, kIdle = 3'600'000;  // in ms; libcurl's timers may end the wait earlier
     curl_multi_poll(multi.get(), nullptr, 0, queue.empty() ? kIdle : kCheckWaiting, nullptr);
   }
 }
@@ -165,7 +166,7 @@ void CurlHTTPClient::Impl::startNext() {
     const auto now = std::chrono::steady_clock::now();
     for (Transfers one = queue.next(now); !one.empty(); one = queue.next(now)) startOne(std::move(one));
   } catch (const std::bad_alloc&) {
-    // They go on waiting, at most until their time is over.
+    // The others go on waiting until they time out.
   }
 }
 
@@ -178,14 +179,14 @@ void CurlHTTPClient::Impl::startOne(Transfers one) {
     idleHandles.pop_back();
   }
   if (easy && begins(easy.get(), one.front())) {
-    static_cast<void>(easy.release());  // the running transfer has it
+    static_cast<void>(easy.release());  // owned by the running transfer
     return running.splice(running.end(), one);
   }
   if (easy) keep(std::move(easy));
   end(std::move(one), Failure{CurlTransfer::outOfMemory()});
 }
 
-// False: there is no memory for it, and nothing has changed.
+// False if there is no memory for it; then nothing has changed.
 bool CurlHTTPClient::Impl::begins(CURL* easy, CurlTransfer& transfer) {
   try {
     return transfer.attach(easy, connections, std::chrono::steady_clock::now()) &&
@@ -212,7 +213,7 @@ void CurlHTTPClient::Impl::finish() {
   }
 }
 
-// Those that run are timed by libcurl.
+// libcurl times out the transfers that run.
 void CurlHTTPClient::Impl::endExpired() {
   const auto now = std::chrono::steady_clock::now();
   Transfers taken = queue.take([now](const CurlTransfer& transfer) { return transfer.expired(now); });
@@ -273,7 +274,7 @@ Result<Done, HTTPError> CurlHTTPClient::start(HTTPRequest request, HTTPCompletio
 
 HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
   if (stopping()) return Failure{CurlTransfer::stopping()};
-  // The giver may not be done with it when the waiter has gone.
+  // Shared, because the completion may still use it when the waiting thread returns.
   const auto answer = std::make_shared<std::promise<HTTPResult>>();
   std::future<HTTPResult> given = answer->get_future();
   const auto taken = _impl->file(

@@ -1,4 +1,4 @@
-// HTTPS requests. Any thread may start one; completions run on the client's own thread and must not block.
+// HTTPS requests. Any thread may start one; completions run on the client's thread and must not block.
 #pragma once
 
 #include <chrono>
@@ -20,7 +20,7 @@ namespace veltrad::http {
 
 using HTTPHeaders = std::vector<std::pair<std::string, std::string>>;
 
-// A body that is read from a file's beginning as it is sent.
+// A body that is read from the beginning of a file while it is sent.
 struct FileBody {
   std::shared_ptr<const FileDescriptor> file;
   std::uint64_t bytes = 0;
@@ -28,36 +28,42 @@ struct FileBody {
 
 struct HTTPRequest {
   enum class Method { get, post };
-  // What bounds apply. Storebag requests are always admitted; at most 1,024 event posts are under way; three
-  // file uploads run at a time and three of log data, others wait, and their time has not begun.
+  // Decides which limits apply. Storebag requests are always admitted. At most 1,024 event posts are in
+  // progress. Three file uploads and three uploads of log data run at a time; the time-out of the others has
+  // not begun.
   enum class Lane { storebag, event, upload, logData };
 
   Method method = Method::get;
   Lane lane = Lane::event;
-  std::string url;  // https only
-  HTTPHeaders
-      headers;  // control characters are removed from values; "Content-Length" is always the body's own
+  // Must begin with https.
+  std::string url;
+  // Control characters are removed from values. The value of "Content-Length" is replaced by the body's
+  // length.
+  HTTPHeaders headers;
   std::string body;
-  std::optional<FileBody> fileBody;  // instead of `body`
-  // What the request and its completion keep, charged by its maker; paid back after the completion has run.
+  // Instead of `body`.
+  std::optional<FileBody> fileBody;
+  // What the request and its completion keep, charged by the caller and released after the completion has
+  // run.
   platform::Charge charge;
-  // False: the answer's body is thrown away as it comes, and one that is too large ends the connection but
-  // not the request: its status counts.
+  // If false, the answer's body is discarded; one that is too large ends the connection, but the status
+  // counts.
   bool keepsAnswer = true;
-  // Posts of one sequence to one host begin in order: each when the one before it has ended, but 100 ms after
-  // it came at the latest, so that a slow host takes several at once. 0: none.
+  // Posts of one sequence to one host begin in order: each when the previous one has ended, or 100 ms after
+  // it was started, so that a slow host takes several at once. 0: no sequence.
   std::uintptr_t sequence = 0;
-  std::chrono::milliseconds timeout{60'000};  // total, waiting included; connecting alone at most 10 s
-  // Instead of a total time: at least this many bytes a second over 60 s (uploads); 0: `timeout` holds.
+  // For the whole request, waiting included; at most 10 s of it for connecting.
+  std::chrono::milliseconds timeout{60'000};
+  // If not 0, replaces the time-out: the minimum speed, averaged over 60 s.
   std::uint32_t leastBytesPerSecond = 0;
-  // Of the answer's body, counted as bytes come; beyond it the connection is closed. Headers: 64 KiB and 256
-  // lines at most.
+  // Limit for the answer's body, beyond which the connection is closed. Headers: 64 KiB and 256 lines.
   std::size_t mostResponseBytes = 16u << 20;
 };
 
 struct HTTPResponse {
   int status = 0;
-  HTTPHeaders headers;  // of the last answer, names as sent; none where the answer is not kept
+  // Of the last answer; empty if the answer is not kept.
+  HTTPHeaders headers;
   std::string body;
 
   // The first value under this name, letter case ignored.
@@ -65,23 +71,22 @@ struct HTTPResponse {
 };
 
 struct HTTPError {
-  enum class Kind {
-    transport,  // refused, unresolvable, not trusted, cut, timed out, headers over their bound; not https
-    tooLarge,   // the answer is over its bound; `status` is the answer's
-    tooMany,    // over the lane's bound; nothing was sent
-    shortage,   // no descriptor, thread or memory for it just now; nothing was sent
-    stopping,   // the daemon is stopping
-  };
+  // transport: refused, not resolved, not trusted, cut, timed out, not https, or headers beyond their limit.
+  // tooLarge: the answer is beyond its limit. tooMany: the lane is full. shortage: no descriptor, thread or
+  // memory. With tooMany and shortage nothing was sent.
+  enum class Kind { transport, tooLarge, tooMany, shortage, stopping };
+  Kind kind = Kind::transport;
+  // One line: "Could not resolve host: x".
+  std::string description;
+  // Of an incomplete answer; 0 if none arrived.
+  int status = 0;
   // Where a transport error ended the exchange.
   enum class Cause { other, resolve, connect, trust, timeout };
-  Kind kind = Kind::transport;
-  std::string description;  // one line, a system text: "Could not resolve host: x"
-  int status = 0;           // of an answer that then was cut; 0: none came
   Cause cause = Cause::other;
 };
 
-// What the request keeps until its completion has run, what libcurl copies of it included; not what the
-// completion itself keeps.
+// What the request keeps until its completion has run, including libcurl's copies, without the completion
+// itself.
 std::size_t keptBytes(const HTTPRequest& request);
 
 using HTTPResult = Result<HTTPResponse, HTTPError>;
@@ -90,39 +95,41 @@ using HTTPCompletion = std::function<void(HTTPResult)>;
 class HTTPClient {
  public:
   virtual ~HTTPClient() = default;
-  // Done: `completion` will run exactly once, never inside this call. Else the request was not taken
-  // (tooMany, shortage) and the completion never runs.
+  // If it succeeds, `completion` runs exactly once, never inside this call. Otherwise (tooMany, shortage) it
+  // never runs.
   virtual Result<Done, HTTPError> start(HTTPRequest request, HTTPCompletion completion) = 0;
-  // Waits for the answer on the caller's thread; fails at once with `stopping` after failBlockingWaits().
+  // Waits for the answer. Fails at once with `stopping` after failBlockingWaits().
   virtual HTTPResult perform(HTTPRequest request) = 0;
-  // perform() fails at once: work that leads to one can be given up.
+  // True if perform() fails at once.
   virtual bool stopping() const { return false; }
 };
 
 struct HTTPClientSettings {
-  std::string extraCertificatesPath;  // PEM, trusted beside the system's; no such file: none
+  // Certificates in PEM form that are trusted besides the system's. The file may be missing.
+  std::string extraCertificatesPath;
 };
 
 // "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
 std::string transportLibraries();
 
-// libcurl's multi interface on one thread, which starts with the first request; where it cannot, the next
-// request tries again. Never forks; SIGPIPE must be ignored.
+// libcurl's multi interface on one thread, which the first request starts. Never forks; SIGPIPE must be
+// ignored.
 class CurlHTTPClient final : public HTTPClient {
  public:
   explicit CurlHTTPClient(HTTPClientSettings settings);
-  ~CurlHTTPClient() override;  // ends every transfer with `stopping`, then joins
+  // Ends every transfer with `stopping`.
+  ~CurlHTTPClient() override;
   Result<Done, HTTPError> start(HTTPRequest request, HTTPCompletion completion) override;
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 
-  // From now on perform() fails at once, those that wait included.
+  // From now on perform() fails at once; this ends calls that wait, too.
   void failBlockingWaits();
-  // Waits until no transfer is under way, at most until `deadline`; what is left then ends with `stopping`.
+  // Waits at most until `deadline` for all transfers to end, then ends the others with `stopping`.
   void drain(std::chrono::steady_clock::time_point deadline);
-  // True when an empty task passed the thread within `within`; true also when the thread was never started.
+  // True if the thread has run an empty task within this time, or was never started.
   bool passesEmptyTask(std::chrono::milliseconds within);
-  // Event posts that have neither completed nor failed.
+  // The number of event posts that have not ended.
   std::size_t underWay() const;
   // By address.
   std::vector<ServerRecord> servers() const;

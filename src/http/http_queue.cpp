@@ -1,4 +1,4 @@
-// Which HTTP request runs next, and the account of what is under way.
+// Decides which HTTP request runs next, and counts those in progress.
 #include "http/http_queue.h"
 
 #include <algorithm>
@@ -65,7 +65,7 @@ HTTPQueue::Orders HTTPQueue::look() {
   return _orders;
 }
 
-// A stop may be ordered after the look: what comes then is not begun any more.
+// A stop may have been ordered since look(); then nothing more is begun.
 HTTPQueue::Transfers HTTPQueue::next(Time now) {
   const Lock lock(_mutex);
   if (_orders.stopping) return {};
@@ -98,7 +98,7 @@ HTTPQueue::Transfers HTTPQueue::nextOf(Bulk& bulk) {
 }
 
 HTTPQueue::Transfers::iterator HTTPQueue::Host::firstInTurn(Time now) {
-  std::uintptr_t busy = 0;  // mostly all that wait are of one sequence: it is looked up once
+  std::uintptr_t busy = 0;  // saves look-ups, since most posts that wait are of one sequence
   return std::find_if(posts.begin(), posts.end(), [&](const CurlTransfer& post) {
     const bool waits = post.sequence() == busy || runningOfSequence.count(post.sequence()) > 0;
     if (post.sequence() == 0 || !waits || post.arrived() + kLongestInOrder <= now) return true;

@@ -1,5 +1,4 @@
-// The requests that may not use a connection yet: any thread leaves one here, the HTTP thread asks which is
-// next.
+// The queue of HTTP requests, from any thread to the HTTP thread.
 #pragma once
 
 #include <array>
@@ -18,63 +17,67 @@
 
 namespace veltrad::http {
 
-// Storebags go at once. Uploads run three at a time, log data too, each in order but for hosts that are full.
-// Posts of one sequence begin one after the other, but wait for each other no longer than kLongestInOrder.
-// All but storebags share kPostConnections for each host, of which uploads and log data leave some to posts,
-// so that a host that hangs or is slow keeps neither the others nor its own storebags and posts waiting.
+// Storebag requests begin at once. Three uploads and three uploads of log data run at a time, in order except
+// for hosts that are full. Posts of one sequence begin in order, but wait for each other no longer than
+// kLongestInOrder. All except storebag requests share kPostConnections for each host, and uploads and log
+// data leave some of these to posts. So a slow host delays neither other hosts nor its own storebag requests
+// and posts.
 //
-// A request begins in next() and nowhere else. Its lock is a leaf; it never calls out. Lists, so that handing
-// a transfer on needs no memory: what was admitted cannot be lost for want of it.
+// Only next() begins a request. Its lock is a leaf. Transfers are in lists, so that moving one needs no
+// memory and an admitted request cannot be lost.
 class HTTPQueue {
  public:
   using Time = CurlTransfer::Time;
   using Transfers = std::list<CurlTransfer>;
 
   static constexpr std::size_t kMostEvents = 1024;
-  static constexpr std::size_t kConnections = 8;      // to one host
-  static constexpr std::size_t kPostConnections = 6;  // of them; the others are the storebags'
-  static constexpr std::size_t kBulkConnections = 4;  // of these, for uploads and log data
-  static constexpr std::size_t kBulkRunning = 3;      // of each lane
+  // Connections to one host: in all; of these, for all but storebag requests; of these, for uploads and log
+  // data.
+  static constexpr std::size_t kConnections = 8;
+  static constexpr std::size_t kPostConnections = 6;
+  static constexpr std::size_t kBulkConnections = 4;
+  // Uploads that run at a time, and the same for log data.
+  static constexpr std::size_t kBulkRunning = 3;
   static constexpr std::chrono::milliseconds kLongestInOrder{100};
 
-  // Any thread; but for waits and questions the caller wakes the HTTP thread afterwards.
+  // Called by any thread, which wakes the HTTP thread after add(), failBlocking(), stop() and addEmptyTask().
 
-  // `more`: the thread is already on its way. `full`: its lane is.
+  // more: the HTTP thread was woken before. full: the lane is full.
   enum class Added { first, more, full };
-  // Takes the only one of `transfer`, or leaves it there: also where std::bad_alloc is thrown.
+  // Takes the only element of `transfer`. It stays there if the lane is full or std::bad_alloc is thrown.
   Added add(Transfers& transfer);
   void failBlocking();
   bool blockingFails() const;
   void stop(bool forGood);
-  // Kept when the HTTP thread has passed.
+  // Ready when the HTTP thread has called look().
   std::future<void> addEmptyTask();
-  // False when `deadline` passed first.
+  // False if `deadline` passed first.
   bool waitUntilIdle(Time deadline);
-  // Event posts that have neither completed nor failed.
+  // The number of event posts that have not ended.
   std::size_t events() const;
 
-  // HTTP thread.
+  // Called by the HTTP thread.
 
+  // failBlocking: end the transfers of perform(). stopping: end all transfers. last: then end the thread.
   struct Orders {
-    bool failBlocking = false;  // those that wait in perform() end
-    bool stopping = false;      // everything ends
-    bool last = false;          // and then the thread
+    bool failBlocking = false;
+    bool stopping = false;
+    bool last = false;
   };
-  // Empty tasks pass.
   Orders look();
-  // The one that may run now, which from here on counts as running; empty: none may. Where memory is short
-  // std::bad_alloc is thrown and nothing has changed.
+  // A transfer that may run now, which is counted as running; empty if none may. If std::bad_alloc is thrown,
+  // nothing has changed.
   Transfers next(Time now);
   bool empty() const;
-  // Takes out those that match: their places in the lanes are free.
+  // Removes the waiting transfers that match.
   using Predicate = std::function<bool(const CurlTransfer&)>;
   Transfers take(const Predicate& matches);
-  // The same for one that ran, before its completion.
+  // To be called when a running transfer has ended, before its completion.
   void ended(const CurlTransfer& transfer);
-  // After the completion, when what the request kept is free.
+  // To be called after the completion, when the memory of the request is free.
   void completed();
 
-  // Moves one from list to list.
+  // Moves an element into a list of its own.
   static Transfers pop(Transfers& from, Transfers::iterator at);
 
  private:
@@ -85,11 +88,12 @@ class HTTPQueue {
   };
   struct Host {
     std::size_t running = 0;
-    std::size_t bulkRunning = 0;  // of them
+    // Of these, uploads and log data.
+    std::size_t bulkRunning = 0;
     Transfers posts;
     std::map<std::uintptr_t, std::size_t> runningOfSequence;
 
-    // The first of the posts that may begin.
+    // The first post that may begin.
     Transfers::iterator firstInTurn(Time now);
   };
 
@@ -97,16 +101,19 @@ class HTTPQueue {
   Transfers nextOf(Bulk& bulk) REQUIRES(_mutex);
   void leaves(const CurlTransfer& transfer) REQUIRES(_mutex);
 
-  // Its 11 fields are one account: what waits, what runs, what was ordered.
+  // One lock guards what waits, what runs and what was ordered.
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _idle;
   Transfers _storebags GUARDED_BY(_mutex);
-  std::array<Bulk, 2> _bulk GUARDED_BY(_mutex);           // uploads, log data
-  std::map<std::string, Host> _hosts GUARDED_BY(_mutex);  // those of posts that wait and of all that run
-  std::size_t _underWay GUARDED_BY(_mutex) = 0;           // all lanes, completions that still run included
+  // Uploads, log data.
+  std::array<Bulk, 2> _bulk GUARDED_BY(_mutex);
+  std::map<std::string, Host> _hosts GUARDED_BY(_mutex);
+  // Of all lanes, including transfers whose completions are running.
+  std::size_t _underWay GUARDED_BY(_mutex) = 0;
   std::size_t _events GUARDED_BY(_mutex) = 0;
   std::vector<std::promise<void>> _emptyTasks GUARDED_BY(_mutex);
-  bool _news GUARDED_BY(_mutex) = false;  // something came since the HTTP thread looked
+  // Whether something was added since the last look().
+  bool _news GUARDED_BY(_mutex) = false;
   Orders _orders GUARDED_BY(_mutex);
 };
 

@@ -1,4 +1,4 @@
-// Frames of events, and why one is dropped.
+// Makes and sends the frames of events.
 #include "ipc/client_events.h"
 
 #include <fmt/format.h>
@@ -39,7 +39,7 @@ std::optional<std::string> sendEvent(OutQueue& out, std::string_view frame) {
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
   Dictionary body{{key::kOperation, wire::event::kRemoveUploadedFile}};
   body.set(key::kArguments, Dictionary{{key::kCall, callID}});
-  // Within the bound of replies: it is worth as much as the one that follows it.
+  // Has the reserve of replies, since it is as important as the reply that follows it.
   return out.sendReply(wire::makeFrame(wire::FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }
 

@@ -1,4 +1,4 @@
-// The events that the daemon sends to a client. Any thread.
+// The events that the daemon sends to a client, from any thread.
 #pragma once
 
 #include <cstdint>
@@ -11,15 +11,15 @@
 
 namespace veltrad::ipc {
 
-// The frame of a copy for the client's aggregation callback, the same for every client. `timestamp` in
-// seconds since 1970. Everything empty or zero: the end of aggregation.
+// The frame of a copy for a client's aggregation callback. `timestamp` is in seconds since 1970. If
+// everything is empty or zero, it marks the end of the aggregation.
 std::string messageToClient(std::optional<Dictionary> sessionInfo, double timestamp, std::uint16_t category,
                             std::uint16_t type, std::optional<Dictionary> payload);
 
-// Never blocks; no answer is awaited. Why the event was dropped, or nothing.
+// Never blocks. Returns why the event was dropped, if it was.
 std::optional<std::string> sendEvent(OutQueue& out, std::string_view frame);
 
-// Asks the client to remove the file that it uploads with that call. No answer is awaited.
+// Asks the client to remove the file that it uploads with this call. False if the client has gone.
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID);
 
 }  // namespace veltrad::ipc

@@ -1,4 +1,4 @@
-// A client's connection and the listener's delegate, as the agent and the sessions see them.
+// The interfaces of a client's connection and of the listener's delegate.
 #pragma once
 
 #include <functional>
@@ -19,14 +19,14 @@ namespace veltrad::ipc {
 class Listener;
 class Observer;
 
-// Set-up operations are for the delegate's listener() call, before resume(). After resume() the connection's
-// own thread reads frames and runs calls and handlers, one at a time. sendEvent: any thread.
+// The delegate sets it up in its listener() call and then calls resume(). After that the connection's own
+// thread reads frames and runs calls and handlers, one at a time. Any thread may call sendEvent().
 class Connection {
  public:
   virtual ~Connection() = default;
 
   virtual std::string description() const = 0;
-  // Whom what is kept for this client is charged to; null: nobody.
+  // The account to which data kept for this client is charged; may be null.
   virtual std::shared_ptr<platform::MemoryAccount> memoryAccount() const = 0;
   virtual std::optional<Value> valueForEntitlement(std::string_view name) = 0;
   virtual unsigned uid() const = 0;
@@ -35,20 +35,20 @@ class Connection {
   virtual void setObserver(std::shared_ptr<Observer> observer) = 0;
   // A frame of whole length that held no readable call; the connection goes on.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  // Once, when the connection has ended; released afterwards. The session's end() follows it.
+  // Called once, when the connection has ended, before the session's end().
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   virtual void resume() = 0;
 
-  // A frame of client_events.h. Never blocks, and takes a leaf lock alone. Why it was dropped (the client has
-  // gone, or its queue is full), or nothing.
+  // Sends a frame of client_events.h. Never blocks, and takes only leaf locks. Returns why the frame was
+  // dropped, if it was.
   virtual std::optional<std::string> sendEvent(std::string_view frame) = 0;
 };
 
 class ListenerDelegate {
  public:
   virtual ~ListenerDelegate() = default;
-  // True: accepted and resumed. False: refused, and nothing was kept. Runs on the listener's thread, or on
-  // the new connection's own.
+  // True if the connection was accepted and resumed, false if it was refused and is not kept. Runs on the new
+  // connection's thread.
   virtual bool listener(Listener& listener, const std::shared_ptr<Connection>& shouldAcceptNewConnection) = 0;
 };
 

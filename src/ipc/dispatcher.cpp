@@ -1,4 +1,4 @@
-// The table of calls. The connection's own thread.
+// Decodes calls, charges their memory, and runs them by a table of operations.
 #include "ipc/dispatcher.h"
 
 #include <fmt/format.h>
@@ -19,12 +19,13 @@ namespace {
 
 struct Call {
   wire::ClientSessionInterface& session;
-  Dictionary& arguments;  // each is taken out where it is used
+  Dictionary& arguments;
   const std::string& extensionToken;
-  std::shared_ptr<PendingReply> pending;  // null: no reply is wanted
+  // Null if no reply is wanted.
+  std::shared_ptr<PendingReply> pending;
 };
 
-// What is wrong with the arguments; absent when the operation was run.
+// What is wrong with the arguments; absent if the operation was run.
 using Refusal = std::optional<std::string>;
 
 Refusal mustBe(const char* argument, const char* type) {
@@ -51,7 +52,7 @@ Refusal setSessionInfo(Call& call) {
     call.pending->fail(wire::makeReportingError(
         "The session's description is more than the daemon may keep for its user; try again later.", -1));
   }
-  // Nothing comes back but the word that it was done.
+  // The reply has no results.
   if (call.pending) call.pending->answer({});
   return std::nullopt;
 }
@@ -74,9 +75,8 @@ Refusal fetchDisplayURL(Call& call) {
 
 Refusal sendMessageWithCategory(Call& call) {
   const auto category = call.arguments.uint16(key::kCategory);
-  if (!category) return mustBe(key::kCategory, "a number");
   const auto type = call.arguments.uint16(key::kType);
-  if (!type) return mustBe(key::kType, "a number");
+  if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
   call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, key::kPayload),
                                        stringReply(std::move(call.pending)));
   return std::nullopt;
@@ -115,9 +115,8 @@ Refusal uploadLogData(Call& call) {
 
 Refusal sendMessageWithSessionInfo(Call& call) {
   const auto category = call.arguments.uint16(key::kCategory);
-  if (!category) return mustBe(key::kCategory, "a number");
   const auto type = call.arguments.uint16(key::kType);
-  if (!type) return mustBe(key::kType, "a number");
+  if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
   auto sessionInfo = takenDictionary(call, key::kSessionInfo);
   auto userInfo = takenDictionary(call, key::kUserInfo);
   call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
@@ -153,11 +152,6 @@ const Operation* operationNamed(std::string_view name) {
   return nullptr;
 }
 
-// A client's own words in an answer to it: enough to recognise them.
-std::string_view shortened(std::string_view text) {
-  return text.substr(0, 100);
-}
-
 Result<Dictionary, std::string> dictionaryOf(Result<Value, PropertyListError> parsed) {
   if (!parsed) return Failure{"the body is no readable property list: " + parsed.error().detail};
   auto dictionary = std::move(parsed.value()).takeDictionary();
@@ -165,7 +159,7 @@ Result<Dictionary, std::string> dictionaryOf(Result<Value, PropertyListError> pa
   return std::move(*dictionary);
 }
 
-// The memory that a call's values are first thought to need: without shared objects it is enough.
+// A first estimate of the memory for a call's values, which is sufficient if no objects are shared.
 std::size_t expectedMemory(std::string_view body) {
   constexpr std::size_t kLeast = 2048, kBytesOfObject = 64;
   const std::uint64_t objects =
@@ -173,9 +167,9 @@ std::size_t expectedMemory(std::string_view body) {
   return std::min(kLeast + 2 * body.size() + kBytesOfObject * objects, wire::kMostCallMemory);
 }
 
-// What a body's control characters add to the texts that are made of it: six bytes each in JSON, of which
-// there are a compact text, a readable one, and copies for the reply and for the log. In a small body they
-// are no matter.
+// The bytes that a body's control characters add to the texts made from it. Each takes six bytes in JSON, of
+// which there are a compact and a readable text, and copies for the reply and the log. In a small body this
+// is negligible.
 std::size_t escapesOf(std::string_view body) {
   constexpr std::size_t kSmallBody = 16u << 10, kMoreBytesEach = 5, kTexts = 5;
   if (body.size() <= kSmallBody) return 0;
@@ -184,7 +178,7 @@ std::size_t escapesOf(std::string_view body) {
   return kTexts * kMoreBytesEach * static_cast<std::size_t>(controls);
 }
 
-// Of a call whose values keep so much: what is copied of them and written on the way counts, too.
+// The charge for a call whose values take `memory`, including copies and texts that are made while it runs.
 std::size_t chargeOf(std::size_t memory, std::string_view body) {
   return memory + memory / 2 + 2 * body.size() + escapesOf(body) + 4096;
 }
@@ -211,7 +205,7 @@ Result<Dictionary, std::string> decodeCall(const wire::Frame& frame, CallMemory&
   PropertyListLimits limits{wire::kFrameBodyLimit, wire::kMostFrameDepth, wire::kMostCallObjects,
                             wire::kMostCallMemory};
   for (limits.memory = expectedMemory(frame.body);; limits.memory = wire::kMostCallMemory) {
-    // Nothing is held while it waits, so that calls never wait for each other in a ring.
+    // Nothing is held during the wait, so that calls cannot wait for each other.
     memory.charge.release();
     if (memory.account && !chargeCall(memory, chargeOf(limits.memory, frame.body))) {
       return Failure{usedUp(memory)};
@@ -223,7 +217,7 @@ Result<Dictionary, std::string> decodeCall(const wire::Frame& frame, CallMemory&
   }
 }
 
-// Its bytes were charged when its header came; it does not wait for more.
+// The call was charged when its header arrived; it does not wait for more memory.
 Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMemory& memory) {
   constexpr std::size_t kBytesOfObject = 64;
   const std::size_t bytes = memory.charge.bytes();
@@ -232,7 +226,7 @@ Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMe
   PropertyListLimits limits{wire::kLargeFrameBodyLimit, wire::kMostFrameDepth, wire::kMostCallObjects,
                             wire::kLargeFrameBodyLimit};
   for (;; objects *= 2) {
-    // Shared objects are found on the way: then it is read again with more.
+    // If objects are shared, the limit is too low, and the body is read again with a higher one.
     if (frame.refused || (memory.account && !memory.charge.resize(bytes + kBytesOfObject * objects))) {
       return Failure{usedUp(memory)};
     }
@@ -243,6 +237,11 @@ Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMe
     if (!more) return dictionaryOf(std::move(parsed));
     objects = std::max<std::size_t>(objects, 64);
   }
+}
+
+// Enough of a client's own words to recognise them.
+std::string_view shortened(std::string_view text) {
+  return text.substr(0, 100);
 }
 
 struct Decoded {

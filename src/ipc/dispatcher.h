@@ -1,4 +1,4 @@
-// From a call's frame to the session's operation. The connection's own thread.
+// Runs the calls in frames on a session, on the connection's own thread.
 #pragma once
 
 #include <chrono>
@@ -16,22 +16,26 @@
 
 namespace veltrad::ipc {
 
-// A client's call waits for its user's memory no longer than this; then it ends with an error.
+// A call that has waited this long for its user's memory ends with an error.
 inline constexpr std::chrono::seconds kLongestWaitForMemory{60};
 
-// Who pays for a call's values, before they are made.
+// The memory for a call's values, which is charged before they are made.
 struct CallMemory {
-  const std::shared_ptr<platform::MemoryAccount>& account;  // null: nobody
-  platform::Charge charge;                                  // held until the call has run
+  // May be null.
+  const std::shared_ptr<platform::MemoryAccount>& account;
+  // Held until the call has run.
+  platform::Charge charge;
   platform::Counters& counters;
-  std::function<bool()> giveUp;  // true: the call must wait no longer
-  bool usedUp = false;           // the call was not run for want of it, and has been counted
+  // Returns true if the call must not wait any longer.
+  std::function<bool()> giveUp;
+  // Set if the call was counted and not run because there was no memory.
+  bool usedUp = false;
 };
 
-// Runs the call that the frame holds on `session`; its replies go to `out`. When the frame holds no readable
-// call, nothing runs and the answer says in one sentence what is wrong with it: "unknown operation "x"",
-// "argument "category" must be a number". Format: docs/wire-protocol.md. `extensionToken` is that of the file
-// that came with the frame; empty: none.
+// Runs the call in the frame on `session`; its reply goes to `out`. If the frame holds no readable call,
+// nothing runs and the result says what is wrong: "unknown operation "x"", "argument "category" must be a
+// number". Format: docs/wire-protocol.md. `extensionToken` is the token of the file that was lent with the
+// frame, or empty.
 std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSessionInterface& session,
                                         const std::shared_ptr<OutQueue>& out, CallMemory& memory,
                                         const std::string& extensionToken = {});

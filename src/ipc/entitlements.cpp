@@ -1,18 +1,16 @@
-// The rules of who may do what. Any thread; the file is reread when it changed.
+// Reads the entitlement rules and applies them to peers.
 #include "ipc/entitlements.h"
 
 #include <algorithm>
 #include <utility>
 
-#include "formats/property_list.h"
-#include "platform/file_store.h"
 #include "platform/log.h"
 
 namespace veltrad::ipc {
 
 namespace {
 
-// An id exactly: no boolean, no real, nothing that would have to be wrapped.
+// Only an integer within the range of IDs.
 std::optional<unsigned> idOf(const Value& value) {
   if (value.type() != Value::Type::signedInteger && value.type() != Value::Type::unsignedInteger)
     return std::nullopt;
@@ -21,7 +19,7 @@ std::optional<unsigned> idOf(const Value& value) {
   return static_cast<unsigned>(*number);
 }
 
-// A condition of the wrong type is never met: read as absent, it would make the rule wider.
+// A condition of the wrong type never matches: ignoring it would make the rule grant more.
 bool matches(const Dictionary& rule, const Peer& peer) {
   const Value* uid = rule.find("uid");
   const Value* gid = rule.find("gid");
@@ -39,7 +37,7 @@ bool matches(const Dictionary& rule, const Peer& peer) {
   return true;
 }
 
-// Why the rule can never grant anything; nothing when it can.
+// Says why the rule can never grant anything; absent if it can.
 std::optional<std::string> problemOf(const Value& value) {
   const Dictionary* rule = value.asDictionary();
   if (!rule) return "expected a dictionary";
@@ -56,27 +54,20 @@ std::optional<std::string> problemOf(const Value& value) {
 
 struct ReadRules {
   Array rules;
-  std::optional<std::string> shortage;
   std::optional<std::string> error;
   std::vector<std::string> warnings;
 };
 
-ReadRules readRules(platform::FileStore& files, const std::string& path) {
+ReadRules rulesIn(const platform::LocalContent& content) {
+  using Kind = platform::LocalContent::Kind;
   ReadRules read;
-  const auto bytes = files.read(path);
-  if (!bytes) {
-    const platform::FileFailure& failure = bytes.error();
-    if (failure.passes()) {
-      read.shortage = failure.description;
-    } else if (failure.kind != platform::FileFailure::Kind::notFound) {
-      read.error = failure.description;
-    }
-    return read;
-  }
-  const auto list = formats::parsePropertyList(bytes.value());
-  const Array* rules = list ? list.value().asArray() : nullptr;
+  if (content.warning) read.warnings.push_back(*content.warning);
+  if (content.kind == Kind::absent) return read;
+  const Array* rules = content.kind == Kind::good ? content.value.asArray() : nullptr;
   if (!rules) {
-    read.error = path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
+    read.error = content.kind == Kind::broken
+                     ? content.error
+                     : content.placeOf({}) + ": the outermost value is not an array of rules";
     return read;
   }
   read.rules = *rules;
@@ -84,13 +75,15 @@ ReadRules readRules(platform::FileStore& files, const std::string& path) {
   for (std::size_t i = 0; i < rules->size(); ++i) {
     const Value& rule = (*rules)[i];
     if (const auto problem = problemOf(rule)) {
-      read.warnings.push_back(path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
+      const std::string number = std::to_string(i);
+      read.warnings.push_back(content.placeOf({number}) + ": rule " + number +
+                              " grants nothing: " + *problem);
     } else {
       namesUnits = namesUnits || rule.asDictionary()->contains("unit");
     }
   }
   if (namesUnits && !kernelTellsUnits()) {
-    read.warnings.push_back(path +
+    read.warnings.push_back(content.path +
                             ": rules with \"unit\" never match, this kernel does not tell a peer's process");
   }
   return read;
@@ -118,10 +111,9 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
   });
 }
 
-Entitlements::Entitlements(platform::FileStore& files, std::string path)
-    : _files(files), _path(std::move(path)) {}
+Entitlements::Entitlements(platform::FileStore& files, const std::string& path) : _file(files, path) {}
 
-// Logged once the lock is released.
+// Log lines, written after the lock was released.
 struct Entitlements::Said {
   std::optional<std::string> error;
   std::optional<std::string> shortage;
@@ -129,21 +121,27 @@ struct Entitlements::Said {
 };
 
 void Entitlements::refresh(Said& said) {
-  // The stamp comes first: a file that changes while it is read is read again.
-  const auto stamp = _files.stamp(_path);
-  if (!stamp) {
-    said.shortage = stamp.error().description;
+  auto now = _file.content();
+  if (!now) {
+    said.shortage = now.error().description;
     return;
   }
-  if (_read && stamp.value() == _stamp) return;
-  ReadRules fresh = readRules(_files, _path);
-  said.shortage = std::move(fresh.shortage);
-  if (said.shortage) return;
+  if (now.value() == _content) return;
+  _content = std::move(now).value();
+  ReadRules fresh = rulesIn(*_content);
   _rules = std::move(fresh.rules);
   said.error = std::move(fresh.error);
   said.warnings = std::move(fresh.warnings);
-  _stamp = stamp.value();
-  _read = true;
+}
+
+void Entitlements::readAgain() {
+  Said said;
+  {
+    Lock lock(_mutex);
+    _file.readAgain();
+    refresh(said);
+  }
+  say(said);
 }
 
 std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {

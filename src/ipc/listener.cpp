@@ -1,4 +1,4 @@
-// Accepting, bounding, reaping. Each function says in listener.h or here whose thread runs it.
+// Accepts and limits connections, and joins the threads that have ended.
 #include "ipc/listener.h"
 
 #include <fcntl.h>
@@ -19,12 +19,12 @@ namespace veltrad::ipc {
 
 namespace {
 
-// How long the accepting thread rests when the system has no descriptor or memory left.
+// The pause of the accepting thread when the system has no descriptor or memory left.
 constexpr int kPauseMilliseconds = 100;
-// Whoever waits to be accepted is looked at with so many others.
+// The number of clients that are accepted before any of them is handled.
 constexpr std::size_t kMostAtOnce = 64;
 
-// A copy of descriptor 0, which is always there: the sandbox lets nobody open a path for it.
+// A copy of descriptor 0, which is always open, because the sandbox allows no path for this.
 FileDescriptor openSpare() {
   return FileDescriptor(::fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 0));
 }
@@ -38,7 +38,7 @@ std::string refusedPeer(const Peer& peer, const std::string& unit, const std::st
       wire::kVeltraEntitlement, entitlementsPath);
 }
 
-// A peer that gets no connection is told why all the same; its queue is empty, so this cannot block.
+// Tells the peer why it is refused. Its queue is empty, so this does not block.
 void refuseSocket(FileDescriptor socket, const std::string& description) {
   const std::string frame = refusalFrame(description);
   ::send(socket.get(), frame.data(), frame.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
@@ -48,18 +48,9 @@ void refuseSocket(FileDescriptor socket, const std::string& description) {
 }  // namespace
 
 Listener::Listener(ListenerOptions options, ListenerDelegate& delegate)
-    : _delegate(delegate),
-      _entitlements(options.entitlements),
-      _lentFiles(options.lentFiles),
-      _counters(options.counters),
-      _memory(options.memory),
-      _entitlementsPath(std::move(options.entitlementsPath)),
-      _mostConnections(options.mostConnections),
-      _mostConnectionsOfOneUser(options.mostConnectionsOfOneUser),
-      _connectionsForOwner(options.connectionsForOwner),
-      _entitlement(std::move(options.entitlement)),
+    : _options(std::move(options)),
+      _delegate(delegate),
       _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
-      _socket(std::move(options.socket)),
       _spare(openSpare()) {}
 
 Listener::~Listener() {
@@ -86,7 +77,7 @@ std::size_t Listener::invalidate(std::chrono::steady_clock::time_point deadline)
   }
   wake();
   _acceptThread.join();
-  _socket.close();
+  _options.socket.close();
   std::vector<std::shared_ptr<SocketConnection>> connections;
   {
     Lock lock(_mutex);
@@ -113,7 +104,7 @@ void Listener::wake() {
 // The accepting thread, from here to reap().
 void Listener::acceptLoop() {
   while (true) {
-    pollfd watched[] = {{_socket.listening(), POLLIN, 0}, {_wakeUp.get(), POLLIN, 0}};
+    pollfd watched[] = {{_options.socket.listening(), POLLIN, 0}, {_wakeUp.get(), POLLIN, 0}};
     ::poll(watched, 2, -1);
     if (watched[1].revents != 0) {
       std::uint64_t count = 0;
@@ -126,12 +117,12 @@ void Listener::acceptLoop() {
   }
 }
 
-// Those whose user id alone refuses them come last, so that a user who is turned away as fast as he comes
-// holds nobody up.
+// Clients that are refused by their user ID are handled last, so that a user who connects again and again
+// does not delay others.
 void Listener::acceptSome() {
   std::vector<Arrived> arrived;
   arrived.reserve(kMostAtOnce);
-  pollfd watched{_socket.listening(), POLLIN, 0};
+  pollfd watched{_options.socket.listening(), POLLIN, 0};
   do {
     if (!acceptOne(arrived)) break;
   } while (arrived.size() < kMostAtOnce && ::poll(&watched, 1, 0) > 0);
@@ -143,9 +134,9 @@ void Listener::acceptSome() {
   }
 }
 
-// False: there is nobody more for now.
+// False if no more clients are waiting or can be accepted.
 bool Listener::acceptOne(std::vector<Arrived>& arrived) {
-  FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
+  FileDescriptor socket(::accept4(_options.socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
   if (socket.isOpen()) {
     auto peer = credentialsOfSocket(socket.get());
     std::string refusal = peer ? refusalOf(peer.value()) : std::string();
@@ -167,23 +158,24 @@ bool Listener::acceptOne(std::vector<Arrived>& arrived) {
   }
 }
 
-// What can be said without looking up anything but the credentials.
+// Decides by the credentials only; empty if they do not suffice for a refusal.
 std::string Listener::refusalOf(const Peer& peer) {
   if (auto bound = boundReached(peer.uid)) return std::move(*bound);
-  if (_entitlement.empty() || _entitlements.mayHold(_entitlement, peer.uid)) return {};
-  _counters.count(wire::Reason::not_entitled);
+  if (_options.entitlement.empty() || _options.entitlements.mayHold(_options.entitlement, peer.uid))
+    return {};
+  _options.counters.count(wire::Reason::not_entitled);
   logDebug(
       "listener: new Vopex connection %s does not have required veltra entitlement. Closing connection...",
       SocketConnection::describe(_nextNumber++, peer).c_str());
-  return refusedPeer(peer, "not looked up", _entitlementsPath);
+  return refusedPeer(peer, "not looked up", _options.entitlementsPath);
 }
 
-// The table of descriptors is full: the spare one lets this client be told, and the queue move on.
+// No descriptor is left. The spare one is used to accept and refuse this client, so that the queue moves on.
 void Listener::acceptWithSpare(int error) {
   warnOfAccept(error);
-  _counters.count(wire::Reason::no_descriptor);
+  _options.counters.count(wire::Reason::no_descriptor);
   _spare.reset();
-  FileDescriptor socket(::accept4(_socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
+  FileDescriptor socket(::accept4(_options.socket.listening(), nullptr, nullptr, SOCK_CLOEXEC));
   if (socket.isOpen()) {
     refuseSocket(std::move(socket),
                  "Connection refused: the daemon has no descriptor left; try again later.");
@@ -192,7 +184,7 @@ void Listener::acceptWithSpare(int error) {
   if (!_spare.isOpen()) pause(error);
 }
 
-// Nothing can be accepted for now; trying again at once would only burn time.
+// Waits, because an immediate attempt would fail again.
 void Listener::pause(int error) {
   warnOfAccept(error);
   pollfd watched{_wakeUp.get(), POLLIN, 0};
@@ -209,18 +201,18 @@ void Listener::warnOfAccept(int error) {
 void Listener::admit(FileDescriptor socket) {
   auto peer = peerOfSocket(socket.get());
   if (!peer) {
-    _counters.count(wire::Reason::peer_unknown);
+    _options.counters.count(wire::Reason::peer_unknown);
     return refuseSocket(std::move(socket),
                         "Connection refused: the kernel does not say who you are: " + peer.error());
   }
   const unsigned uid = peer.value().uid;
   if (const auto bound = boundReached(uid)) return refuseSocket(std::move(socket), *bound);
   const std::uint64_t number = _nextNumber++;
-  auto connection =
-      std::make_shared<SocketConnection>(number, std::move(socket), std::move(peer.value()), _entitlements,
-                                         _lentFiles, _counters, _memory.accountOf(uid));
+  auto connection = std::make_shared<SocketConnection>(number, std::move(socket), std::move(peer.value()),
+                                                       _options.entitlements, _options.lentFiles,
+                                                       _options.counters, _options.memory.accountOf(uid));
   if (connection->usable() && startClient(number, uid, connection)) return;
-  _counters.count(wire::Reason::no_thread);
+  _options.counters.count(wire::Reason::no_thread);
   connection->refuse("Connection refused: the daemon has no thread or descriptor left; try again later.");
   warnOfAccept(EAGAIN);
 }
@@ -229,24 +221,24 @@ std::optional<std::string> Listener::boundReached(unsigned uid) {
   bool all = false;
   {
     Lock lock(_mutex);
-    all = _clients.size() >= _mostConnections - (isOwner(uid) ? 0 : _connectionsForOwner);
+    all = _clients.size() >= _options.mostConnections - (isOwner(uid) ? 0 : _options.connectionsForOwner);
     const auto mine = _clientsOfUser.find(uid);
-    if (!all && (mine == _clientsOfUser.end() || mine->second < _mostConnectionsOfOneUser))
+    if (!all && (mine == _clientsOfUser.end() || mine->second < _options.mostConnectionsOfOneUser))
       return std::nullopt;
   }
   if (all) {
-    _counters.count(wire::Reason::too_many_connections);
+    _options.counters.count(wire::Reason::too_many_connections);
     return fmt::format("Connection refused: {} connections are open, and no more are taken.",
-                       _mostConnections - _connectionsForOwner);
+                       _options.mostConnections - _options.connectionsForOwner);
   }
-  _counters.count(wire::Reason::too_many_of_user);
+  _options.counters.count(wire::Reason::too_many_of_user);
   return fmt::format("Connection refused: uid {} has {} connections open, and no more are taken of one user.",
-                     uid, _mostConnectionsOfOneUser);
+                     uid, _options.mostConnectionsOfOneUser);
 }
 
 bool Listener::startClient(std::uint64_t number, unsigned uid,
                            const std::shared_ptr<SocketConnection>& connection) {
-  // The thread's last act takes the lock, so it finds its entry whole.
+  // The thread takes the lock before it uses its entry, which is then complete.
   Lock lock(_mutex);
   Client& client = _clients[number];
   client.connection = connection;
@@ -278,9 +270,9 @@ void Listener::runConnection(std::uint64_t number, SocketConnection& connection)
   if (_delegate.listener(*this, connection.shared_from_this())) {
     connection.run();
   } else {
-    _counters.count(wire::Reason::not_entitled);
+    _options.counters.count(wire::Reason::not_entitled);
     connection.refuse(
-        refusedPeer(connection.peer(), connection.peer().unit.value_or("none"), _entitlementsPath));
+        refusedPeer(connection.peer(), connection.peer().unit.value_or("none"), _options.entitlementsPath));
   }
   Lock lock(_mutex);
   _finished.push_back(std::move(_clients[number].thread));

@@ -1,5 +1,4 @@
-// The front door: accepts clients, gives each connection a thread of its own and reaps the threads that
-// ended.
+// Accepts clients, gives each connection its own thread, and joins the threads that have ended.
 #pragma once
 
 #include <chrono>
@@ -29,7 +28,8 @@ struct ListenerOptions {
   platform::LentFiles& lentFiles;
   platform::Counters& counters;
   platform::MemoryBudget& memory;
-  std::string entitlementsPath;  // platform::Root::entitlementsPath(), for the text of a refusal
+  // For the text of a refusal.
+  std::string entitlementsPath;
   std::size_t mostConnections = 4096;
   std::size_t mostConnectionsOfOneUser = 1024;
   // Of them, those that root and the daemon's own user alone may have.
@@ -38,34 +38,31 @@ struct ListenerOptions {
   std::string entitlement = wire::kVeltraEntitlement;
 };
 
-// Job: every client that connects gets a Connection, on which the delegate decides on that connection's own
-// thread; a refused one gets a refusal frame that says why. The delegate, the entitlements, the lent files
-// and the counters outlive it. resume() and invalidate() belong to the thread that made it, which is never a
-// connection's own.
+// Makes a Connection for every client, which the delegate accepts or refuses on the connection's own thread.
+// A refused client gets a refusal frame that says why. The delegate and what the options refer to must
+// outlive it. resume() and invalidate() are called by the thread that made it, never by a connection's
+// thread.
 //
-// Its 22 fields are what each connection is given and the bounds, what accepting needs, and the connections
-// that it must find again when it stops.
+// Its 13 fields are the options, what accepting needs, and the connections that it must find again when it
+// stops.
 class Listener {
  public:
   Listener(ListenerOptions options, ListenerDelegate& delegate);
-  // Invalidates first if nobody did, and waits for every thread without a bound.
+  // Invalidates, and waits for every thread without a time limit.
   ~Listener();
-  Listener(const Listener&) = delete;
-  Listener& operator=(const Listener&) = delete;
 
-  // Starts the accepting thread, once. False when no thread could be had; the reason is logged.
+  // Starts the accepting thread. False if there is no thread or descriptor, which is logged.
   bool resume();
 
-  // Stops: closes the listening socket (and removes its file if this process made it), takes no more bytes
-  // from any client, runs the frames that had arrived whole, invalidates every connection and joins all
-  // threads. Waits until `deadline` at most: then calls that wait for their turn are given up, and the answer
-  // is the number of connections whose call is still running; their threads are joined by the destructor.
-  // Twice does nothing new.
+  // Closes the listening socket (and removes its file if this process made it), reads nothing more from
+  // clients, runs the frames that have arrived completely, invalidates every connection and joins all
+  // threads. Calls that have not begun by `deadline` are dropped. Returns the number of connections whose
+  // call is still running then; the destructor joins their threads. May be called again.
   std::size_t invalidate(std::chrono::steady_clock::time_point deadline);
 
   // Any thread.
   std::size_t connectionCount();
-  std::size_t mostConnections() const { return _mostConnections; }
+  std::size_t mostConnections() const { return _options.mostConnections; }
 
  private:
   struct Client {
@@ -77,8 +74,10 @@ class Listener {
   void acceptLoop();
   struct Arrived {
     FileDescriptor socket;
-    Peer peer;            // credentials alone
-    std::string refusal;  // empty: none that its user id tells
+    // Only its credentials are known.
+    Peer peer;
+    // Empty if the credentials do not suffice for a refusal.
+    std::string refusal;
   };
   void acceptSome();
   bool acceptOne(std::vector<Arrived>& arrived);
@@ -94,26 +93,17 @@ class Listener {
   void runConnection(std::uint64_t number, SocketConnection& connection);
   void forget(std::uint64_t number) REQUIRES(_mutex);
 
-  // Constant after construction.
+  // Constant after construction, except for the socket, which is closed when the accepting thread has ended.
+  ListenerOptions _options;
   ListenerDelegate& _delegate;
-  Entitlements& _entitlements;
-  platform::LentFiles& _lentFiles;
-  platform::Counters& _counters;
-  platform::MemoryBudget& _memory;
-  const std::string _entitlementsPath;
-  const std::size_t _mostConnections;
-  const std::size_t _mostConnectionsOfOneUser;
-  const std::size_t _connectionsForOwner;
-  const std::string _entitlement;
   const FileDescriptor _wakeUp;
 
-  // The accepting thread's while it runs, else the owner's.
-  ServiceSocket _socket;
+  // Used by the accepting thread while it runs, else by the owner.
   FileDescriptor _spare;
   std::chrono::steady_clock::time_point _lastWarning{};
   std::uint64_t _nextNumber = 1;
 
-  // The owner's.
+  // Used by the owner.
   Thread _acceptThread;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};

@@ -1,4 +1,4 @@
-// Frames on their way out. See out_queue.h for who runs what.
+// Writes, queues, charges and limits frames to a client.
 #include "ipc/out_queue.h"
 
 #include <sys/eventfd.h>
@@ -16,9 +16,9 @@ static_assert(kOutQueueBound == wire::kFrameBodyLimit + wire::kFrameHeaderBytes)
 
 namespace {
 
-// A client that goes on writing while it is shut out could keep us reading: so many reads at most.
+// Limits the reads from a client that goes on writing while its connection is closed.
 constexpr int kMostDrainingReads = 1024;
-// What waits, and as much again while it grows.
+// A growing buffer takes up to twice the bytes that wait.
 constexpr std::size_t kBytesOfByte = 2;
 
 }  // namespace
@@ -67,7 +67,7 @@ OutQueue::Sent OutQueue::put(std::string_view frame, Kind kind) {
   if (_waiting.empty()) {
     if (!writeSome(frame)) return Sent::gone;
     if (frame.empty()) return Sent::done;
-    // What has begun must be whole, or nothing that follows can be read.
+    // A frame that was written in part must be completed.
     const bool begun = frame.size() < whole;
     if (!charge(frame.size(), kind) && !begun) return Sent::full;
     _waiting.assign(frame);
@@ -94,7 +94,7 @@ bool OutQueue::charge(std::size_t bytes, Kind kind) {
   return more.has_value();
 }
 
-// What was written is no longer charged, whichever kind it was.
+// Releases the charge of what was written, of either kind.
 void OutQueue::payBack(std::size_t waiting) {
   const std::size_t wanted = kBytesOfByte * waiting;
   const std::size_t replies = std::min(_replies.bytes(), wanted);
@@ -102,7 +102,7 @@ void OutQueue::payBack(std::size_t waiting) {
       _events.resize(std::min(_events.bytes(), wanted - replies)) && _replies.resize(replies);
 }
 
-// Takes what was written off `bytes`. False: the client has gone.
+// Removes what was written from `bytes`. False if the client has gone.
 bool OutQueue::writeSome(std::string_view& bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::send(_socket.get(), bytes.data(), bytes.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
@@ -133,7 +133,7 @@ void OutQueue::stopReading() {
 void OutQueue::wake() {
   if (!_wakeUp.isOpen()) return;
   const std::uint64_t one = 1;
-  // Full means that a wake-up is already waiting.
+  // It only fails if a wake-up is pending.
   [[maybe_unused]] const ssize_t written = ::write(_wakeUp.get(), &one, sizeof one);
 }
 
@@ -178,7 +178,8 @@ void OutQueue::close() {
 }
 
 void closeGently(FileDescriptor socket) {
-  // Once shut down the peer can write no more; an empty receive queue then makes the close an orderly one.
+  // After the shutdown the peer cannot write. Closing with an empty receive queue lets it read what was
+  // written.
   ::shutdown(socket.get(), SHUT_RDWR);
   char bytes[4096];
   for (int i = 0; i < kMostDrainingReads; ++i) {

@@ -1,4 +1,4 @@
-// What waits to be written to one client. Any thread, but for the operations marked as the connection's own.
+// The frames that wait to be written to one client.
 #pragma once
 
 #include <atomic>
@@ -14,57 +14,49 @@
 
 namespace veltrad::ipc {
 
-// Bytes that wait for one client at most, whether events or replies; a frame of the largest size fits.
+// The bytes of events that may wait for one client; a frame of the largest size fits.
 inline constexpr std::size_t kOutQueueBound = (1u << 20) + 12;
-// What replies may fill beyond it, so that events never cost a client the answer that it waits for.
+// The bytes by which replies may exceed this, so that events never displace them.
 inline constexpr std::size_t kReplyReserve = 1u << 20;
-// Beyond this many waiting bytes the connection takes no further calls until the client has read some
-// answers.
+// If more bytes wait, the connection runs no further calls until the client has read some.
 inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
 
-// Job: takes frames from any thread, writes them without blocking and in order, and bounds what a slow reader
-// costs, in bytes and within what its user may keep. Owns the socket and the wake-up descriptor. Shared by
-// the connection and by everybody who may still answer or send, so it may outlive the connection; the
-// counters outlive it. Its 14 fields: the descriptors stand here twice, for their owner under the lock and as
-// numbers for the connection's thread, which polls without it.
+// Takes frames from any thread, writes them in order without blocking, and limits the memory for a client
+// that does not read. Owns the socket and the wake-up descriptor. Shared by the connection and by everything
+// that may still answer, so it may outlive the connection; the counters must outlive it. Its 14 fields hold
+// the descriptors twice: as owners under the lock, and as numbers for the connection's thread, which polls
+// without it.
 class OutQueue {
  public:
-  enum class Sent {
-    done,      // written, or waiting for the connection's thread to write it
-    full,      // beyond the bound: dropped
-    tooLarge,  // one frame beyond the bound of a frame: dropped
-    gone,      // the client has closed, or the connection has ended: dropped
-  };
+  // done: written, or waiting to be written. The frame was dropped for the others. full: too many bytes wait.
+  // tooLarge: the frame is beyond the limit of a frame. gone: the client or the connection has ended.
+  enum class Sent { done, full, tooLarge, gone };
 
-  // Without a socket the client is gone from the start. What waits is charged to `account`; null: to nobody.
+  // `account` may be null.
   OutQueue(FileDescriptor socket, platform::Counters& counters,
            std::shared_ptr<platform::MemoryAccount> account);
-  OutQueue(const OutQueue&) = delete;
-  OutQueue& operator=(const OutQueue&) = delete;
 
-  // A reply, hello or refusal, which has the reserve too; `full` also ends the connection.
+  // For replies, hellos and refusals, which may use the reserve. `full` also ends the connection.
   Sent sendReply(std::string_view frame);
   Sent sendEvent(std::string_view frame);
 
-  // Asks the connection's thread to end the connection as soon as its present call is done.
+  // Asks the connection's thread to end the connection after its current call.
   void requestEnd();
   bool endRequested() const { return _endRequested.load(std::memory_order_relaxed); }
-  // The client can send no further byte; what it sent before can still be read. The connection's thread is
-  // woken.
+  // The client cannot send any more; what it sent before can still be read. Wakes the connection's thread.
   void stopReading();
 
-  // The connection's own thread.
-  // False: the system gave no wake-up descriptor.
+  // The following are for the connection's own thread.
+
+  // False if there was no wake-up descriptor.
   bool usable() const { return _readSocket >= 0 && _readWakeUp >= 0; }
   int socket() const { return _readSocket; }
   int wakeUp() const { return _readWakeUp; }
-  // Before it looks for what woke it.
   void drainWakeUp();
   std::size_t waitingBytes() const { return _waitingBytes.load(std::memory_order_relaxed); }
-  // Writes what the socket takes now; the number of bytes that still wait.
+  // Writes as much as possible, and returns the number of bytes that still wait.
   std::size_t flush();
-  // Ends the conversation: nothing is read or written afterwards. Bytes of the client that nobody read do not
-  // destroy what was written to it.
+  // Closes the socket so that the client can still read what was written to it.
   void close();
 
  private:
@@ -77,14 +69,15 @@ class OutQueue {
   void giveUp() REQUIRES(_mutex);
   void wake() REQUIRES(_mutex);
 
-  // Constant after construction; the connection's own thread alone may use the numbers, until its close().
+  // Constant after construction. Only the connection's own thread may use the numbers, until it calls
+  // close().
   platform::Counters& _counters;
   const std::shared_ptr<platform::MemoryAccount> _account;
   const int _readSocket;
   const int _readWakeUp;
 
   std::atomic<bool> _endRequested{false};
-  // Written under the lock; a hint for the connection's thread, which is woken after it rose from zero.
+  // Written under the lock; read by the connection's thread, which is woken when it rises from zero.
   std::atomic<std::size_t> _waitingBytes{0};
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
@@ -92,12 +85,14 @@ class OutQueue {
   FileDescriptor _wakeUp GUARDED_BY(_mutex);
   bool _gone GUARDED_BY(_mutex) = false;
   std::string _waiting GUARDED_BY(_mutex);
-  platform::Charge _events GUARDED_BY(_mutex);   // kept: nobody need ever read them
-  platform::Charge _replies GUARDED_BY(_mutex);  // working: their calls are waited for
-  std::size_t _written GUARDED_BY(_mutex) = 0;   // of _waiting
+  // Events are charged as kept, replies as working memory.
+  platform::Charge _events GUARDED_BY(_mutex);
+  platform::Charge _replies GUARDED_BY(_mutex);
+  // Bytes of _waiting that were written.
+  std::size_t _written GUARDED_BY(_mutex) = 0;
 };
 
-// Shuts a socket down and closes it so that the peer can still read what was written to it.
+// Closes a socket so that the peer can still read what was written to it.
 void closeGently(FileDescriptor socket);
 
 }  // namespace veltrad::ipc

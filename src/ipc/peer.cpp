@@ -1,4 +1,4 @@
-// The kernel's word on a peer. Any thread; keeps nothing open.
+// Asks the kernel about peers.
 #include "ipc/peer.h"
 
 #include <fcntl.h>
@@ -21,8 +21,7 @@ namespace {
 constexpr int SO_PEERPIDFD = 77;  // Linux 6.5
 #endif
 
-// What could not be asked for a shortage: errno, else 0. The peer's unit is not known then, which is not
-// none.
+// Remembers the errno of a shortage, or 0. After a shortage it is unknown whether the peer has a unit.
 struct Asked {
   int shortage = 0;
   bool failed(int error) {
@@ -46,7 +45,7 @@ std::optional<std::string> contents(const std::string& path, Asked& asked) {
   return std::nullopt;
 }
 
-// What follows `prefix` on the first line that begins with it.
+// The rest of the first line that begins with `prefix`.
 std::optional<std::string> lineAfter(std::string_view text, std::string_view prefix) {
   while (!text.empty()) {
     const auto end = text.find('\n');
@@ -57,7 +56,7 @@ std::optional<std::string> lineAfter(std::string_view text, std::string_view pre
   return std::nullopt;
 }
 
-// The process that a pidfd names; 0 when it is dead (-1) or in another process namespace (0).
+// The process of a pidfd; 0 if it is dead (-1) or in another process namespace (0).
 int processOfPidfd(int pidfd, Asked& asked) {
   const auto information = contents("/proc/self/fdinfo/" + std::to_string(pidfd), asked);
   const auto text = information ? lineAfter(*information, "Pid:\t") : std::nullopt;
@@ -79,7 +78,7 @@ std::optional<std::string> unitOfPeer(int socket, Asked& asked) {
   const int pid = processOfPidfd(pidfd.get(), asked);
   if (pid == 0) return std::nullopt;
   const auto groups = contents("/proc/" + std::to_string(pid) + "/cgroup", asked);
-  // A process that is alive now was so when its groups were read: the number was not another's in between.
+  // If the process is still alive, the number was its own when the groups were read.
   if (!groups || processOfPidfd(pidfd.get(), asked) != pid) return std::nullopt;
   auto path = lineAfter(*groups, "0::");
   for (std::string_view left = *groups; !path && !left.empty();) {  // cgroup v1: "N:name=systemd:/path"
@@ -93,7 +92,7 @@ std::optional<std::string> unitOfPeer(int socket, Asked& asked) {
   return path ? systemUnitOfControlGroup(*path) : std::nullopt;
 }
 
-// Empty or errno.
+// The error is an errno.
 Result<std::vector<unsigned>, int> supplementaryGroups(int socket) {
   std::vector<unsigned> groups(64);
   while (true) {
@@ -154,7 +153,7 @@ bool kernelTellsUnits() {
   return pidfdOfPeer(one.get(), asked).isOpen() || asked.shortage != 0;
 }
 
-// Slices nest above the unit; what lies below the first unit is the unit's own to name, so it says nothing.
+// A unit lies below its slices. Names below the unit are chosen by the unit itself and are not trusted.
 std::optional<std::string> systemUnitOfControlGroup(const std::string& path) {
   std::string_view left = path;
   bool first = true;

@@ -1,4 +1,4 @@
-// From results to reply frames. Any thread.
+// Sends results as reply frames.
 #include "ipc/pending_reply.h"
 
 #include <fmt/format.h>
@@ -37,7 +37,7 @@ void PendingReply::send(Dictionary body) noexcept {
   try {
     sendFrame(std::move(body));
   } catch (const std::bad_alloc&) {
-    _out->requestEnd();  // a client that waits for this reply must not wait for ever
+    _out->requestEnd();  // so that the client does not wait for this reply for ever
   }
 }
 

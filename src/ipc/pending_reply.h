@@ -1,4 +1,4 @@
-// One call's answer, still owed. Any thread.
+// The reply to one call, to be sent from any thread.
 #pragma once
 
 #include <atomic>
@@ -11,16 +11,14 @@
 
 namespace veltrad::ipc {
 
-// Job: sends the reply to one call, at most once; when it goes without an answer, the client's call ends with
-// the error "The daemon gave no reply.". Holds the out-queue alone, so it may outlive the connection.
+// Sends the reply to one call, once. If it is destroyed without an answer, the call ends with the error "The
+// daemon gave no reply.". It may outlive the connection.
 class PendingReply {
  public:
   PendingReply(std::shared_ptr<OutQueue> out, std::uint32_t callID) : _out(std::move(out)), _callID(callID) {}
   ~PendingReply();
-  PendingReply(const PendingReply&) = delete;
-  PendingReply& operator=(const PendingReply&) = delete;
 
-  // Only the first of all calls to either counts.
+  // Only the first call of either function counts.
   void answer(Dictionary results);
   void fail(const wire::ReportingError& error);
 
@@ -33,7 +31,8 @@ class PendingReply {
   std::atomic<bool> _answered{false};
 };
 
-// The callbacks that a session gets. Each is empty when `pending` is null: the client wants no reply.
+// The callbacks for a session. Each is empty if `pending` is null, which means that the client wants no
+// reply.
 wire::StringReply stringReply(std::shared_ptr<PendingReply> pending);
 wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending);
 wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending);

@@ -1,4 +1,4 @@
-// Lock, stale socket, bind, listen. One thread at a time.
+// Takes the lock, removes a stale socket and makes the listening one.
 #include "ipc/service_socket.h"
 
 #include <fcntl.h>
@@ -48,7 +48,7 @@ std::optional<std::string> removeStale(const std::string& path) {
   return std::nullopt;
 }
 
-// The socket's own status is of no use: it has an inode of another file system.
+// `made` gets the status of the file; fstat on the socket would show an inode of another file system.
 Result<FileDescriptor, std::string> listenAt(const std::string& path, struct stat& made) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -64,7 +64,7 @@ Result<FileDescriptor, std::string> listenAt(const std::string& path, struct sta
   if (::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     return Failure{fmt::format("The socket {} cannot be made: {}.", path, reason(errno))};
   }
-  // The entitlement decides who may use it, not the file mode.
+  // Access is decided by the entitlement, not by the file's mode.
   if (::lstat(path.c_str(), &made) != 0 || ::chmod(path.c_str(), 0666) != 0 ||
       ::listen(socket.get(), kWaitingConnections) != 0) {
     const int error = errno;

@@ -13,25 +13,24 @@
 
 namespace veltrad::ipc {
 
-// A listening Unix stream socket. With a lock, run/veltrad/lock is held as long as the object lives.
+// A listening Unix stream socket. Holds the lock that it was given as long as it exists.
 class ServiceSocket {
  public:
-  // The socket's file, where this process made it: as it was then.
+  // The socket's file if this process made it, to recognise it later.
   struct Made {
     std::string path;
     dev_t device = 0;
     ino_t file = 0;
   };
-  // Without `made`: a socket that was handed over.
+  // `made` is absent for a socket that was handed over.
   ServiceSocket(FileDescriptor listening, FileDescriptor lock, std::optional<Made> made)
       : _listening(std::move(listening)), _lock(std::move(lock)), _made(std::move(made)) {}
   ServiceSocket(ServiceSocket&&) = default;
-  ServiceSocket& operator=(ServiceSocket&&) = delete;
   ~ServiceSocket() { close(); }
 
   int listening() const { return _listening.get(); }
-  // Stops listening and removes the socket's file if this process made it and nothing else has taken its
-  // place; keeps the lock. Twice does nothing.
+  // Stops listening, and removes the socket's file if this process made it and it was not replaced. Keeps the
+  // lock. May be called again.
   void close();
 
  private:
@@ -40,10 +39,9 @@ class ServiceSocket {
   std::optional<Made> _made;
 };
 
-// Takes the lock, then uses `handedOver` (socket activation) as it is, or removes a stale socket file and
-// makes run/veltrad/com.florn.veltrad.sock: mode 0666, close-on-exec, non-blocking, 1,024 connections waiting
-// at most. The run directory must be there. The error is one line that names what is in the way and what to
-// do.
+// Takes the lock, then uses `handedOver` (socket activation), or replaces a stale socket file and makes
+// run/veltrad/com.florn.veltrad.sock: mode 0666, close-on-exec, non-blocking, with a backlog of 1,024. The
+// run directory must exist. The error is one line that says what is wrong and what to do.
 Result<ServiceSocket, std::string> openServiceSocket(const platform::Root& root,
                                                      std::optional<int> handedOver);
 

@@ -1,4 +1,4 @@
-// The life of a connection; all of it but stop() on the connection's own thread.
+// Receives frames, runs their calls and ends the connection.
 #include "ipc/socket_connection.h"
 
 #include <fmt/format.h>
@@ -22,9 +22,10 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// What waits for a client that has said its last word is written for so long, not longer.
+// The time for writing what still waits when a connection ends.
 constexpr std::chrono::seconds kLastWrites{1};
-// Unfinished frames of the same user hold all that they may: most of them end soon, some never.
+// The wait while unfinished frames take all memory that the user may use for them: most of them end soon,
+// some never.
 constexpr std::chrono::seconds kLongestWaitForFrames{2};
 
 }  // namespace
@@ -91,7 +92,8 @@ void SocketConnection::serve() {
   }
 }
 
-// Every whole frame that is there, unless the client must first read what waits for it. False: the end.
+// Runs all frames that have arrived, unless the client must first read what waits for it. False if the
+// connection must end.
 bool SocketConnection::runFrames() {
   wire::Frame frame;
   while (!_out->endRequested() && !overdue()) {
@@ -115,7 +117,7 @@ bool SocketConnection::runFrames() {
   return false;
 }
 
-// Some more bytes, or the end of them. False: the end of all.
+// Receives more bytes, or their end. False if the connection must end.
 bool SocketConnection::receive() {
   while (true) {
     if (_reader.moreLikely()) {
@@ -144,8 +146,8 @@ bool SocketConnection::receive() {
   }
 }
 
-// What is kept for the client's user besides frames ends by itself, so that it is worth a wait. False: no
-// more.
+// Waits for memory, since all but unfinished frames of the user will release theirs. False if it has waited
+// too long.
 bool SocketConnection::waitForRoom() {
   const auto now = Clock::now();
   if (!_lackingRoomSince) _lackingRoomSince = now;
@@ -155,13 +157,13 @@ bool SocketConnection::waitForRoom() {
   return true;
 }
 
-// Until the client has taken enough of what waits for it, or somebody woke us. Frames that have come may be
-// waiting in the reader all the while, so bytes to read are none of its business.
+// Waits until the client has read enough, or for a wake-up. Frames may wait in the reader, so it does not
+// wait for bytes to read.
 void SocketConnection::waitForClientToRead() {
   if (_out->flush() > kOutQueueHighWater) poll(POLLOUT);
 }
 
-// Until the client has sent something, or takes something that waits for it, or somebody woke us.
+// Waits until the client has sent something, for room to write what waits, or for a wake-up.
 void SocketConnection::waitForBytes() {
   _reader.rest();
   poll(_out->flush() > 0 ? POLLIN | POLLOUT : POLLIN);
@@ -183,13 +185,14 @@ bool SocketConnection::runFrame(const wire::Frame& frame) {
     if (!_greeted) return greet(frame);
     if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
   } catch (const std::bad_alloc&) {
-    // The call's reply, where one is owed, has said that it ended without an answer.
+    // The destructor of the call's PendingReply has sent an error.
     _counters.count(wire::Reason::call_out_of_memory);
   }
   return true;
 }
 
-// What came with the frame is lent for the call, whose reply follows a request to remove the file.
+// The descriptor is lent for the duration of the call. A request to remove the file precedes the call's
+// reply.
 std::optional<std::string> SocketConnection::runCall(const wire::Frame& frame, FileDescriptor lent) {
   if (!lent.isOpen()) return dispatch(frame);
   const auto loan = _lentFiles.lend(std::move(lent), _peer.pid, [out = _out, callID = frame.header.callID] {
@@ -239,7 +242,7 @@ bool SocketConnection::violation(const std::string& description) {
   return endWith(wire::Reason::protocol_broken, description);
 }
 
-// The client is told why, and the connection ends.
+// Tells the client why the connection ends.
 bool SocketConnection::endWith(wire::Reason counted, const std::string& description) {
   _counters.count(counted);
   logDebug("connection: %s ends: %s", _description.c_str(), description.c_str());

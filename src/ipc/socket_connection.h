@@ -18,29 +18,30 @@
 
 namespace veltrad::ipc {
 
-// Job: reads frames, runs the calls in them one at a time on the exported session, and ends the session when
-// the client has gone. One thread, the connection's own, runs run(), and in it every call and handler; stop()
-// and sendEvent() may be called by any thread. Entitlements, lent files and
-// counters outlive it. A session and its connection hold each other until run() returns.
+// Reads frames, runs the calls in them one at a time on the exported session, and ends the session when the
+// client has gone. The connection's own thread runs run(), and in it every call and handler; any thread may
+// call stop() and sendEvent(). Entitlements, lent files and counters must outlive it. A session and its
+// connection hold each other until run() returns.
 //
-// Its 18 fields are the services that a call may need, what the delegate has set, and how far the
-// conversation has come.
+// Its 18 fields are the services that a call needs, what the delegate has set, and the state of the
+// conversation.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
   SocketConnection(std::uint64_t number, FileDescriptor socket, Peer peer, Entitlements& entitlements,
                    platform::LentFiles& lentFiles, platform::Counters& counters,
                    std::shared_ptr<platform::MemoryAccount> account);
 
-  // False: the system had no wake-up descriptor for it.
+  // False if there was no wake-up descriptor.
   bool usable() const { return _out->usable(); }
   const Peer& peer() const { return _peer; }
 
-  // The whole life after the delegate said yes: frames until the end, then the invalidation handler, the
-  // session's end(), and the socket closed.
+  // To be called once after the delegate has accepted: serves the client until the connection ends, then
+  // calls the invalidation handler and the session's end(), and closes the socket.
   void run();
-  // The whole life after the delegate said no: the client is told why, and the socket closed.
+  // To be called instead if the delegate has refused: tells the client why and closes the socket.
   void refuse(const std::string& description);
-  // The client's bytes end here: frames that came whole are run, up to `deadline`; then the connection ends.
+  // Reads nothing more. Frames that have arrived completely are run until `deadline`; then the connection
+  // ends.
   void stop(std::chrono::steady_clock::time_point deadline);
 
   // "connection 12 (uid 0, pid 345)"
@@ -90,7 +91,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   platform::LentFiles& _lentFiles;
   platform::Counters& _counters;
 
-  // Own thread only.
+  // Used only by the connection's own thread.
   SocketReader _reader;
   std::shared_ptr<wire::ClientSessionInterface> _session;
   std::shared_ptr<Observer> _observer;  // instead of a session
@@ -98,16 +99,16 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   std::function<void()> _invalidationHandler;
   bool _resumed = false;
   bool _greeted = false;
-  bool _ended = false;  // the client's bytes have ended
+  // The client sends nothing more.
+  bool _ended = false;
   std::optional<std::chrono::steady_clock::time_point> _lackingRoomSince;
 
-  // Any thread.
   std::atomic<bool> _stopping{false};
   std::atomic<std::chrono::steady_clock::rep> _deadline{
       std::chrono::steady_clock::time_point::max().time_since_epoch().count()};
 };
 
-// A refusal's frame; for sockets that get no connection at all, too.
+// A refusal's frame, also for sockets that get no connection.
 std::string refusalFrame(const std::string& description);
 
 }  // namespace veltrad::ipc

@@ -1,4 +1,4 @@
-// recvmsg, and nothing else that reads. The connection's own thread.
+// Reads with recvmsg, and charges the buffer.
 #include "ipc/socket_reader.h"
 
 #include <sys/socket.h>
@@ -15,14 +15,14 @@ namespace veltrad::ipc {
 namespace {
 
 constexpr std::size_t kLeastRoom = wire::kIdleReadBytes;
-// Of the bytes of a large call's body: the frame, its values, and what is made of them.
+// The memory of a large call in relation to its body: the frame, its values, and what is made from them.
 constexpr std::size_t kLargeCallFactor = 3;
 constexpr std::size_t kMostRoom = 64u << 10;
 constexpr std::size_t kDescriptorsAtOnce = 4;
 // A client may send several frames with one descriptor each in a single message.
 constexpr std::size_t kMostDescriptors = 16;
 
-// False: more came than there was room for.
+// False if there were too many.
 bool takeControl(msghdr& message, std::deque<FileDescriptor>& into) {
   for (cmsghdr* part = CMSG_FIRSTHDR(&message); part != nullptr; part = CMSG_NXTHDR(&message, part)) {
     if (part->cmsg_level != SOL_SOCKET || part->cmsg_type != SCM_RIGHTS) continue;
@@ -31,8 +31,8 @@ bool takeControl(msghdr& message, std::deque<FileDescriptor>& into) {
       int number = -1;
       std::memcpy(&number, CMSG_DATA(part) + i * sizeof number, sizeof number);
       FileDescriptor came(number);
-      // Closed at once, or a client that lends its own end would keep its connection. Its place stays taken:
-      // the frame that announced it runs without a file.
+      // Closed at once, or a client that sends its own end would keep its connection open. The closed one
+      // keeps its place, so that the frame that announced it runs without a file.
       if (wire::isNoRegularFile(number)) came.reset();
       into.push_back(std::move(came));
     }
@@ -66,7 +66,7 @@ SocketReader::Got SocketReader::receive(int socket) {
   if (count == 0) return Got::end;
   const auto came = static_cast<std::size_t>(count);
   _frames.received(came);
-  // A message with descriptors ends a read early, a full buffer late.
+  // Descriptors and a full buffer both end a read before all bytes were read.
   _moreLikely = came == size || message.msg_controllen > 0;
   _wanted = came == size ? kMostRoom : kLeastRoom;
   return Got::bytes;
@@ -86,7 +86,7 @@ bool SocketReader::chargeMore(std::size_t bytes) {
       _charge.add(std::move(*more));
       return true;
     }
-    // What the user's batches hold makes room for what it sends now.
+    // Older data of the user, such as batches, is dropped to make room.
     if (hopeless() || !_account->dropOldest()) return false;
   }
 }

@@ -1,4 +1,4 @@
-// Bytes and descriptors from a socket, and who pays for them. The connection's own thread.
+// Reads bytes and descriptors from a socket, and charges their memory. Used by the connection's own thread.
 #pragma once
 
 #include <deque>
@@ -11,38 +11,32 @@
 
 namespace veltrad::ipc {
 
-// Job: reads without blocking into a FrameReader and queues the descriptors that came along, in order of
-// arrival. Of descriptors that nobody asks for it keeps a few, no more. The buffer is charged to the client's
-// user before it grows, as the bytes of an unfinished frame; log data as a whole call, when its header comes.
+// Reads without blocking into a FrameReader, and queues descriptors in the order of their arrival, up to a
+// limit. The buffer is charged to the client's user as an unfinished frame before it grows; log data is
+// charged as a whole call when its header arrives.
 class SocketReader : private wire::FrameMemory {
  public:
-  enum class Got {
-    bytes,
-    nothing,         // none for now
-    end,             // the client has closed, or its socket failed
-    badDescriptors,  // more than a frame can carry, or the system had no room for them
-    noRoom,          // its user keeps too much just now; nothing was read
-  };
+  // end: the client has closed, or the socket failed. badDescriptors: too many, or the system had no room for
+  // them. noRoom: the user has too much memory in use; nothing was read.
+  enum class Got { bytes, nothing, end, badDescriptors, noRoom };
 
-  // A null account pays for everything.
+  // `account` may be null.
   explicit SocketReader(std::shared_ptr<platform::MemoryAccount> account)
       : _account(std::move(account)), _frames(*this) {}
   SocketReader(const SocketReader&) = delete;
-  SocketReader& operator=(const SocketReader&) = delete;
 
   Got receive(int socket);
   wire::FrameReader::Next next(wire::Frame& frame) { return _frames.next(frame); }
   std::optional<FileDescriptor> takeDescriptor();
-  // Descriptors that belong to no frame: all frames that came were taken, nothing else has begun.
+  // True if there are descriptors that no frame has announced.
   bool strayDescriptors() const { return !_descriptors.empty() && _frames.empty(); }
-  // The last receive() may have left bytes in the socket, so that another one is worth its price.
+  // True if the last receive() may have left bytes in the socket.
   bool moreLikely() const { return _moreLikely; }
-  // After noRoom: unfinished frames hold all that they may, so that waiting is of no use.
+  // True after noRoom if unfinished frames take all memory that they may, so that waiting is useless.
   bool hopeless() const;
-  // What was charged for the large call that next() has just handed out. The buffer is part of it until
-  // rest().
+  // The charge for the large call that next() has just returned. It includes the buffer until rest().
   platform::Charge takeLargeCharge() { return std::move(_large); }
-  // The buffer shrinks to what is in it.
+  // Shrinks the buffer to its content.
   void rest() { _frames.rest(); }
 
  private:
@@ -51,8 +45,9 @@ class SocketReader : private wire::FrameMemory {
   bool chargeMore(std::size_t bytes);
 
   const std::shared_ptr<platform::MemoryAccount> _account;
-  platform::Charge _charge;  // the buffer's
-  platform::Charge _large;   // of a large call that is coming
+  // For the buffer, and for a large call that is arriving.
+  platform::Charge _charge;
+  platform::Charge _large;
   wire::FrameReader _frames;
   std::deque<FileDescriptor> _descriptors;
   std::size_t _wanted = 0;

@@ -1,4 +1,4 @@
-// The kernel's real-time clock. Any thread.
+// The system's real-time clock.
 #include "platform/clock.h"
 
 #include <time.h>

@@ -1,4 +1,4 @@
-// The time of day. Any thread.
+// The time of day.
 #pragma once
 
 #include <cstdint>
@@ -8,11 +8,12 @@ namespace veltrad::platform {
 // Since 1970-01-01 00:00:00 UTC.
 struct TimeValue {
   std::int64_t seconds = 0;
-  std::int32_t microseconds = 0;  // 0 to 999,999
+  // 0 to 999,999
+  std::int32_t microseconds = 0;
   bool operator==(const TimeValue&) const = default;
 };
 
-// seconds + microseconds / 1,000,000
+// Seconds since 1970, with fraction.
 double timevalToSeconds(TimeValue time);
 
 class Clock {

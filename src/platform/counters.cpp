@@ -1,4 +1,4 @@
-// The counters' file.
+// Writes the counters as JSON.
 #include "platform/counters.h"
 
 #include <unistd.h>
@@ -17,7 +17,7 @@ std::uint64_t Counters::total() const {
 
 void Counters::writeIfChanged(FileStore& files, const std::string& path, double startedAt) {
   if (!changed()) return;
-  std::uint64_t sum = 0;  // of what is written; meanwhile others count on
+  std::uint64_t sum = 0;  // of the counts written: other threads go on counting
   std::vector<Dictionary::Entry> counts;
   for (std::size_t i = 0; i < _counts.size(); ++i) {
     const std::uint64_t times = _counts[i].load(std::memory_order_relaxed);

@@ -1,4 +1,4 @@
-// How often each thing happened to a message, by reason. Any thread; nothing is locked.
+// Counts by reason what happens to messages, from any thread and without locks.
 #pragma once
 
 #include <array>
@@ -13,7 +13,7 @@ namespace veltrad::platform {
 class FileStore;
 
 // The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970, "counts": {text: n}}, with
-// the texts of wire/reasons.def; what never happened is not in it.
+// the texts of wire/reasons.def. Counts of 0 are left out.
 class Counters {
  public:
   void count(wire::Reason reason, std::uint64_t times = 1) {
@@ -27,17 +27,18 @@ class Counters {
   // Since the last time that they were written.
   bool changed() const { return total() != _sumWritten.load(std::memory_order_relaxed); }
 
-  // Replaces the file (mode 0644) when something changed since the last time; where that fails, it is tried
-  // again at the next call, with one error line for an episode. One thread at a time; counters_file.h.
+  // Replaces the file (mode 0644) if changed(). After a failure the next call tries again; only the first
+  // failure in a row is logged. One thread at a time.
   void writeIfChanged(FileStore& files, const std::string& path, double startedAt);
 
  private:
   static constexpr std::uint64_t kNever = UINT64_MAX;
 
   std::array<std::atomic<std::uint64_t>, wire::kReasonCount> _counts{};
-  // Counts only grow, so that an equal sum means the same counts.
+  // Counts only grow, so equal sums mean equal counts.
   std::atomic<std::uint64_t> _sumWritten{kNever};
-  bool _failed = false;  // whoever writes alone
+  // Used only by the thread that writes.
+  bool _failed = false;
 };
 
 }  // namespace veltrad::platform

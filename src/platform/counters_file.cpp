@@ -1,4 +1,4 @@
-// Snapshots of the counters, each taken when the disk is free for it.
+// Queues writes of the counters' file.
 #include "platform/counters_file.h"
 
 #include <utility>
@@ -8,7 +8,7 @@
 namespace veltrad::platform {
 
 namespace {
-constexpr std::size_t kMostBytes = 4096;  // of requests, of which there is one
+constexpr std::size_t kMostRequestBytes = 4096;
 }
 
 CountersFile::CountersFile(Counters& counters, FileStore& files, DiskWriter& writer, std::string path,
@@ -18,12 +18,12 @@ CountersFile::CountersFile(Counters& counters, FileStore& files, DiskWriter& wri
       _writer(writer),
       _path(std::move(path)),
       _startedAt(startedAt),
-      _queue(writer, kMostBytes) {}
+      _queue(writer, kMostRequestBytes) {}
 
 bool CountersFile::writeSoon() {
   if (!_counters.changed() || _asked.exchange(true)) return true;
   const auto write = [this] {
-    _asked = false;  // first: what is counted from now on may need a write of its own
+    _asked = false;  // first, because what is counted from now on may need another write
     _counters.writeIfChanged(_files, _path, _startedAt);
   };
   const auto put = _queue.put(write, 1);
@@ -33,7 +33,7 @@ bool CountersFile::writeSoon() {
 
 bool CountersFile::writeLast(std::chrono::steady_clock::time_point deadline) {
   if (!_writer.drain(deadline)) return false;
-  if (!writeSoon()) _counters.writeIfChanged(_files, _path, _startedAt);  // nobody waits for this thread now
+  if (!writeSoon()) _counters.writeIfChanged(_files, _path, _startedAt);
   return _writer.drain(deadline);
 }
 

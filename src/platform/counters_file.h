@@ -1,4 +1,4 @@
-// The counters' file, written by the disk writer. Main thread.
+// Has the disk writer write the counters' file. Main thread.
 #pragma once
 
 #include <atomic>
@@ -12,15 +12,15 @@ namespace veltrad::platform {
 class Counters;
 class FileStore;
 
-// Everything that the constructor takes outlives it.
+// Everything that the constructor takes must outlive it.
 class CountersFile {
  public:
   CountersFile(Counters& counters, FileStore& files, DiskWriter& writer, std::string path, double startedAt);
 
-  // Has the counters written where they changed, unless a write waits already; never waits for the disk. The
-  // owner calls it at most once a second. False: there is no thread to write with; the next call tries again.
+  // Queues a write if the counters changed and none is queued; never waits for the disk. To be called at most
+  // once a second. False if there is no thread to write with; the next call tries again.
   bool writeSoon();
-  // The counters as they are now, once all that waits before them is written; false: not before `deadline`.
+  // Writes the counters as they are now, after everything that is queued. False if `deadline` passed first.
   bool writeLast(std::chrono::steady_clock::time_point deadline);
 
  private:
@@ -28,7 +28,7 @@ class CountersFile {
   FileStore& _files;
   DiskWriter& _writer;
   const std::string _path;
-  const double _startedAt;  // seconds since 1970
+  const double _startedAt;
   std::atomic<bool> _asked{false};
   DiskWriter::Queue _queue;
 };

@@ -1,4 +1,4 @@
-// Jobs in, one after the other out.
+// Queues of jobs, and the thread that runs them in turn.
 #include "platform/disk_writer.h"
 
 #include <algorithm>
@@ -21,7 +21,7 @@ DiskWriter::Lanes::iterator DiskWriter::open(std::size_t most) {
 }
 
 void DiskWriter::close(Lanes::iterator lane) {
-  Lanes closed;  // its jobs are let go after the lock
+  Lanes closed;  // its jobs are destroyed after the lock was released
   const Lock held(_mutex);
   while (lane->runs) _done.wait(_mutex);
   closed.splice(closed.end(), _lanes, lane);

@@ -1,4 +1,4 @@
-// One thread that touches the disk for those who must not wait for it. Any thread.
+// A thread that does disk work for threads that must not wait for the disk.
 #pragma once
 
 #include <chrono>
@@ -13,9 +13,9 @@
 
 namespace veltrad::platform {
 
-// The thread starts with start(), or where none could be had then, with the first job. Jobs of one queue run
-// in order, queues take turns, so that a long one holds up another by one job at a time. Its lock is a leaf,
-// and no job runs under it.
+// The thread is started by start() or, if that fails, by the first job. The jobs of a queue run in order, and
+// queues take turns, so that a long queue delays another one by one job at a time. Its lock is a leaf, and
+// jobs run without it.
 class DiskWriter {
  public:
   using Job = std::function<void()>;
@@ -28,25 +28,25 @@ class DiskWriter {
   struct Lane {
     std::size_t most;
     std::deque<Waiting> waiting;
-    std::size_t bytes = 0;  // with the job that runs
+    // Includes the job that runs.
+    std::size_t bytes = 0;
     bool runs = false;
   };
   using Lanes = std::list<Lane>;
 
  public:
-  // One kind of what is written; its owner counts what is not taken.
+  // The jobs of one owner, who counts those that are not taken.
   class Queue {
    public:
     enum class Put { taken, full, noThread };
 
-    // `writer` outlives it. `most`: bytes that wait; a single job may have more.
+    // `writer` must outlive it. At most `most` bytes wait; a single job may have more.
     Queue(DiskWriter& writer, std::size_t most);
-    // What waits is thrown away; a job that runs is waited for.
+    // Discards the jobs that wait, and waits for one that runs.
     ~Queue();
     Queue(const Queue&) = delete;
-    Queue& operator=(const Queue&) = delete;
 
-    // Never waits. full: others wait before it; noThread: none can be started now, which may pass.
+    // Never waits. full: too many bytes wait before it. noThread: none can be started for now.
     Put put(Job job, std::size_t bytes) { return _writer.put(_lane, std::move(job), bytes); }
 
    private:
@@ -54,15 +54,12 @@ class DiskWriter {
     const Lanes::iterator _lane;
   };
 
-  DiskWriter() = default;
-  // After its queues.
+  // Its queues must have ended.
   ~DiskWriter();
-  DiskWriter(const DiskWriter&) = delete;
-  DiskWriter& operator=(const DiskWriter&) = delete;
 
-  // False: no thread could be had; the first job tries again.
+  // False if no thread can be started; the first job tries again.
   bool start();
-  // Waits until everything is written, at most until `deadline`; false: not everything is.
+  // Waits until all jobs are done. False if `deadline` passed first.
   bool drain(std::chrono::steady_clock::time_point deadline);
 
  private:
@@ -71,13 +68,14 @@ class DiskWriter {
   Queue::Put put(Lanes::iterator lane, Job job, std::size_t bytes);
   bool startThread() REQUIRES(_mutex);
   void run();
-  // The next in turn that has a job, from now on the last in turn; null: none has.
+  // The next lane in turn that has a job, which becomes the last in turn. Null if none has.
   Lane* takeTurn() REQUIRES(_mutex);
   bool busy() const REQUIRES(_mutex);
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  Condition _news;  // for the thread
-  Condition _done;  // for those who wait for it
+  // Signalled to the thread, and by it.
+  Condition _news;
+  Condition _done;
   Lanes _lanes GUARDED_BY(_mutex);
   bool _ends GUARDED_BY(_mutex) = false;
   std::thread _thread GUARDED_BY(_mutex);

@@ -1,17 +1,11 @@
-// NAME=value lines. A pure function; any thread.
+// Parses NAME=value lines.
 #include "platform/environment_file.h"
+
+#include "base/text.h"
 
 namespace veltrad::platform {
 
 namespace {
-
-constexpr std::string_view kBlanks = " \t\r";
-
-std::string_view trimmed(std::string_view text) {
-  const auto begin = text.find_first_not_of(kBlanks);
-  if (begin == std::string_view::npos) return {};
-  return text.substr(begin, text.find_last_not_of(kBlanks) - begin + 1);
-}
 
 std::string unquoted(std::string_view value) {
   const char quote = value.empty() ? '\0' : value.front();

@@ -1,4 +1,4 @@
-// Files of NAME=value lines, as os-release and locale.conf are. A pure function; any thread.
+// Reads values from files of NAME=value lines, such as os-release and locale.conf.
 #pragma once
 
 #include <optional>
@@ -7,8 +7,8 @@
 
 namespace veltrad::platform {
 
-// Format: os-release(5). The last line of that name counts; quotes and the backslashes inside double quotes
-// are taken away. Nothing when there is no such line or its value is empty.
+// Format: os-release(5). The last line with this name counts; quotes, and backslashes outside single quotes,
+// are removed. Absent if there is no such line or its value is empty.
 std::optional<std::string> valueInEnvironmentFile(std::string_view text, std::string_view name);
 
 }  // namespace veltrad::platform

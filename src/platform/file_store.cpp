@@ -1,4 +1,4 @@
-// Files on disk. Any thread; no state of its own.
+// Reads and replaces files on disk.
 #include "platform/file_store.h"
 
 #include <fcntl.h>
@@ -38,17 +38,6 @@ std::string directoryOf(const std::string& path) {
   const auto slash = path.rfind('/');
   if (slash == std::string::npos) return ".";
   return slash == 0 ? "/" : path.substr(0, slash);
-}
-
-// 0, or errno.
-int writeAll(int descriptor, std::string_view bytes) {
-  while (!bytes.empty()) {
-    const ssize_t written = ::write(descriptor, bytes.data(), bytes.size());
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return errno;
-    bytes.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return 0;
 }
 
 // Nothing where it is so already, which needs no right.
@@ -98,7 +87,7 @@ int syncDirectory(const std::string& path) {
   const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!directory.isOpen()) return errno;
   if (::fsync(directory.get()) == 0) return 0;
-  return errno == EINVAL ? 0 : errno;  // EINVAL: a file system that has nothing to sync here
+  return errno == EINVAL ? 0 : errno;  // EINVAL: the file system does not support it
 }
 
 std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
@@ -109,7 +98,7 @@ std::uint64_t mixed(std::uint64_t hash, std::uint64_t number) {
   return hash;
 }
 
-// NAME.XXXXXXXX.new, as replace() makes them.
+// NAME.XXXXXXXX.new, as replace() makes it.
 bool isUnfinishedName(std::string_view name) {
   constexpr std::size_t kDigits = 8;
   constexpr std::string_view kEnd = ".new";
@@ -122,7 +111,7 @@ bool isUnfinishedName(std::string_view name) {
 }  // namespace
 
 Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, std::size_t most) {
-  // O_NONBLOCK: a pipe under that name must not hold the caller.
+  // O_NONBLOCK: a pipe of this name must not block the caller.
   const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!file.isOpen()) return Failure{failureOf(path, errno)};
   struct stat status {};
@@ -132,7 +121,7 @@ Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, st
   }
   if (static_cast<std::uint64_t>(status.st_size) > most) return Failure{tooLarge(path, most)};
 
-  // The size is a hint alone: it is 0 under /proc, and a file may grow.
+  // The size is only a hint: it is 0 under /proc, and a file may grow.
   std::string bytes;
   std::size_t length = 0;
   std::size_t room = static_cast<std::size_t>(status.st_size) + 1;
@@ -171,6 +160,11 @@ Result<Done, FileFailure> DiskFileStore::rename(const std::string& from, const s
   return Done();
 }
 
+Result<Done, FileFailure> DiskFileStore::unlink(const std::string& path) {
+  if (::unlink(path.c_str()) != 0 && errno != ENOENT) return Failure{failureOf(path, errno)};
+  return Done();
+}
+
 Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
@@ -202,7 +196,7 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
       if (error != 0) return Failure{failureOf(part, error)};
     } else if (errno != EEXIST) {
       const int error = errno;
-      // A parent on a read-only or closed file system that is there already is none of our concern.
+      // An existing parent on a read-only or inaccessible file system is no error.
       struct stat status {};
       if (::stat(part.c_str(), &status) != 0) return Failure{failureOf(part, error)};
     }

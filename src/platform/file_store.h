@@ -1,4 +1,4 @@
-// Files as the daemon reads and replaces them. Any thread.
+// Reading and replacing whole files, from any thread.
 #pragma once
 
 #include <cstdint>
@@ -11,12 +11,13 @@
 namespace veltrad::platform {
 
 struct FileFailure {
-  // shortage: no descriptor or memory, or an I/O error, just now. It says nothing about the file, so nobody
-  // remembers it as an answer.
+  // shortage: no descriptor or memory, or an I/O error. It says nothing about the file and must not be
+  // cached.
   enum class Kind { notFound, noAccess, tooLarge, noSpace, other, shortage };
   Kind kind;
   bool passes() const { return kind == Kind::shortage; }
-  std::string description;  // names the path: "/etc/veltrad/x.plist: Permission denied"
+  // "/etc/veltrad/x.plist: Permission denied"
+  std::string description;
 };
 
 using FileStamp = std::optional<std::uint64_t>;
@@ -24,14 +25,16 @@ using FileStamp = std::optional<std::uint64_t>;
 class FileStore {
  public:
   virtual ~FileStore() = default;
-  // A regular file of at most `most` bytes, whole.
+  // The content of a regular file of at most `most` bytes.
   virtual Result<std::string, FileFailure> read(const std::string& path, std::size_t most = 16u << 20) = 0;
-  // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW, mode 0600 unless `mode` says else), syncs,
-  // renames, syncs the directory. On failure the old file is untouched and the new one gone.
+  // Writes a new file in the same directory (O_EXCL, O_NOFOLLOW), syncs it, renames it and syncs the
+  // directory. On failure the old file is unchanged and the new one is removed.
   virtual Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes,
                                             unsigned mode = 0600) = 0;
   // Renames within one directory.
   virtual Result<Done, FileFailure> rename(const std::string& from, const std::string& to) = 0;
+  // Removes a file; one that is not there is removed already.
+  virtual Result<Done, FileFailure> unlink(const std::string& path) = 0;
   // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
   // alone.
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
@@ -48,6 +51,7 @@ class DiskFileStore final : public FileStore {
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
   Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
   Result<Done, FileFailure> rename(const std::string& from, const std::string& to) override;
+  Result<Done, FileFailure> unlink(const std::string& path) override;
   Result<FileStamp, FileFailure> stamp(const std::string& path) override;
 
  private:
@@ -61,8 +65,8 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
 // Gives an open file to the owner of the directory that it was made in. 0, or errno.
 int giveToOwnerOfDirectory(int file, const std::string& path);
 
-// Removes what a replace() that was killed has left in the directory: regular files under its pattern of
-// names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.
+// Removes the files that killed replace() calls left in the directory: NAME.XXXXXXXX.new with eight
+// hexadecimal digits. Returns how many. To be called before anything else writes there.
 std::size_t removeUnfinishedFiles(const std::string& directory);
 
 }  // namespace veltrad::platform

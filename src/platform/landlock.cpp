@@ -1,4 +1,4 @@
-// Landlock's three system calls. Any thread.
+// Landlock's three system calls.
 #include "platform/landlock.h"
 
 #include <sys/syscall.h>
@@ -15,11 +15,6 @@ constexpr long kRestrictSelf = 446;
 constexpr unsigned kAskVersion = 1u << 0;
 constexpr int kRulePathBeneath = 1;
 
-struct RulesetAttributes {
-  std::uint64_t
-      handledFiles;  // the network and the scopes that follow in later ABIs are left out: not handled
-};
-
 struct __attribute__((packed)) PathBeneathAttributes {
   std::uint64_t allowed;
   std::int32_t parent;
@@ -33,8 +28,8 @@ int abi() {
 }
 
 int createRuleset(std::uint64_t handled) {
-  const RulesetAttributes attributes{handled};
-  return static_cast<int>(::syscall(kCreateRuleset, &attributes, sizeof attributes, 0u));  // close-on-exec
+  // The first field of the attributes; without the later ones, network and scopes are not handled.
+  return static_cast<int>(::syscall(kCreateRuleset, &handled, sizeof handled, 0u));
 }
 
 int addPath(int ruleset, int descriptor, std::uint64_t allowed) {

@@ -1,5 +1,5 @@
-// The kernel's Landlock interface by system call and number: the system's headers may be older than the
-// kernel. Any thread. Format: landlock(7), linux/landlock.h.
+// The kernel's Landlock interface (landlock(7)), by number, because the system's headers may be older than
+// the kernel.
 #pragma once
 
 #include <cstdint>
@@ -16,11 +16,11 @@ inline constexpr std::uint64_t kMakeDirectory = 1u << 7;
 inline constexpr std::uint64_t kMakeRegularFile = 1u << 8;
 inline constexpr std::uint64_t kMakeSocket = 1u << 9;
 inline constexpr std::uint64_t kMakeSymbolicLink = 1u << 12;
-inline constexpr std::uint64_t kRefer = 1u << 13;            // ABI 2
-inline constexpr std::uint64_t kTruncate = 1u << 14;         // ABI 3
-inline constexpr std::uint64_t kDeviceIOControl = 1u << 15;  // ABI 5
+inline constexpr std::uint64_t kRefer = 1u << 13;
+inline constexpr std::uint64_t kTruncate = 1u << 14;
+inline constexpr std::uint64_t kDeviceIOControl = 1u << 15;
 
-// Every right over files that a kernel of this ABI knows, up to the last one listed above.
+// All rights over files that a kernel of this ABI knows, up to the last one listed above.
 constexpr std::uint64_t rightsOfABI(int abi) {
   std::uint64_t rights = (kMakeSymbolicLink << 1) - 1;
   if (abi >= 2) rights |= kRefer;
@@ -29,13 +29,13 @@ constexpr std::uint64_t rightsOfABI(int abi) {
   return rights;
 }
 
-// Those of them that a rule on a file may hold; a rule with another one is refused.
+// The rights that a rule on a file may hold; the kernel refuses a rule with any other.
 inline constexpr std::uint64_t kRightsOfFiles =
     kExecute | kWriteFile | kReadFile | kTruncate | kDeviceIOControl;
 
-// The ABI, from 1; 0 for a kernel without Landlock, or with Landlock switched off.
+// The ABI, from 1; 0 if the kernel has no Landlock or it is switched off.
 int abi();
-// A descriptor, or -1 with errno. `handled`: what is refused unless a rule allows it.
+// A close-on-exec descriptor, or -1 with errno. The rights `handled` are refused unless a rule allows them.
 int createRuleset(std::uint64_t handled);
 // 0, or -1 with errno. `descriptor` names the file or directory (O_PATH).
 int addPath(int ruleset, int descriptor, std::uint64_t allowed);

@@ -1,4 +1,4 @@
-// What is lent, by token. Any thread.
+// Lent files by token.
 #include "platform/lent_files.h"
 
 #include "platform/uuid.h"
@@ -20,7 +20,7 @@ std::shared_ptr<const LentFile> LentFiles::consume(const std::string& token) con
 }
 
 void LentFiles::takeBack(const std::string& token) {
-  std::shared_ptr<const LentFile> last;  // closed without the lock
+  std::shared_ptr<const LentFile> last;  // destroyed after the lock was released
   const Lock held(_mutex);
   const auto found = _files.find(token);
   if (found == _files.end()) return;

@@ -1,5 +1,4 @@
-// Files that clients lend to the daemon for the time of one call: each is known by a random token. Any
-// thread.
+// Files that clients lend to the daemon for the duration of one call, each under a random token. Any thread.
 #pragma once
 
 #include <functional>
@@ -13,18 +12,17 @@
 
 namespace veltrad::platform {
 
-// A client's open file: the daemon's only way to it, whatever path the client names. Closed with its last
-// owner.
+// A client's open file. The daemon never opens a path that a client names.
 class LentFile {
  public:
-  // `askForRemoval` is true where the request is on its way.
+  // `askForRemoval` returns true if the request was sent.
   LentFile(FileDescriptor file, pid_t lender, std::function<bool()> askForRemoval)
       : _file(std::move(file)), _lender(lender), _askForRemoval(std::move(askForRemoval)) {}
 
   int descriptor() const { return _file.get(); }
-  // To be asked before anything else is done with the descriptor.
+  // To be checked before the descriptor is used.
   wire::FileOrigin origin() const { return wire::FileOrigin::of(_file.get(), _lender); }
-  // Asks the lender to remove its file, without waiting; the lender may refuse. False: it cannot be asked.
+  // Asks the lender to remove its file, which it may refuse; does not wait. False if it cannot be asked.
   [[nodiscard]] bool askForRemoval() const { return _askForRemoval(); }
 
  private:
@@ -33,16 +31,15 @@ class LentFile {
   const std::function<bool()> _askForRemoval;
 };
 
-// Job: keeps what is lent under its token until the loan ends. Outlives its loans. Its lock is a leaf.
+// Keeps each lent file under its token until the loan ends. Must outlive its loans. Its lock is a leaf.
 class LentFiles {
  public:
-  // What its lender holds; its end takes the token back. Who has consumed it by then keeps the file.
+  // Removes the token when it ends. A file that was consumed before stays open.
   class Loan {
    public:
     Loan(LentFiles& files, std::string token) : _files(files), _token(std::move(token)) {}
     ~Loan() { _files.takeBack(_token); }
     Loan(const Loan&) = delete;
-    Loan& operator=(const Loan&) = delete;
     const std::string& token() const { return _token; }
 
    private:
@@ -51,7 +48,7 @@ class LentFiles {
   };
 
   [[nodiscard]] Loan lend(FileDescriptor file, pid_t lender, std::function<bool()> askForRemoval);
-  // Null: nothing is lent under this token.
+  // Null if nothing is lent under this token.
   std::shared_ptr<const LentFile> consume(const std::string& token) const;
 
  private:

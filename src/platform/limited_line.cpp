@@ -1,4 +1,4 @@
-// The count behind a line. Any thread.
+// Limits a log line to one a second.
 #include "platform/limited_line.h"
 
 #include <utility>

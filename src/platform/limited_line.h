@@ -1,4 +1,4 @@
-// A log line that others can cause at will: said once, then counted. Any thread.
+// Limits the rate of a log line that others can cause at will. Any thread.
 #pragma once
 
 #include <chrono>
@@ -11,9 +11,8 @@
 
 namespace veltrad::platform {
 
-// One line at the first occurrence and at most one a second while they go on; each names how many there were
-// since the line before it where that is more than one: "… (17 copies since the last such line)". The caller
-// logs it, once it holds no lock. Its own lock is a leaf.
+// Gives one line for the first occurrence and then at most one a second. A line that stands for several
+// occurrences says so: "… (17 copies since the last such line)". The caller logs it, without holding a lock.
 class LimitedLine {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -21,9 +20,10 @@ class LimitedLine {
   // What is counted, in the plural: "copies", "posts".
   explicit LimitedLine(std::string_view counted) : _counted(counted) {}
 
-  // The line to log now, or nothing: it is counted into the next one.
+  // The line to log now; absent if the occurrence is only counted.
   std::optional<std::string> happened(std::string text, Time now = std::chrono::steady_clock::now());
-  // What no line has said yet, with the text of the last; nothing when all was said.
+  // A line for the occurrences that no line has reported, with the text of the last one; absent if there are
+  // none.
   std::optional<std::string> rest();
 
  private:

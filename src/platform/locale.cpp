@@ -1,5 +1,4 @@
-// Country and time zone from the process's environment. Any thread; the environment does not change after
-// start.
+// Country and time zone from the environment, which does not change after the start.
 #include "platform/locale.h"
 
 #include <time.h>
@@ -56,12 +55,11 @@ std::optional<std::string> EnvironmentLocale::countryCode() {
   } else if (!configuration.error().passes()) {
     _last.reset();
   }
-  const auto& name = _last;
-  return name ? countryOfLocaleName(*name) : std::nullopt;
+  return _last ? countryOfLocaleName(*_last) : std::nullopt;
 }
 
 int EnvironmentLocale::timeZoneOffset() {
-  ::tzset();  // localtime_r alone does not see a changed zone
+  ::tzset();  // localtime_r does not notice a changed zone
   const time_t now = ::time(nullptr);
   tm parts{};
   ::localtime_r(&now, &parts);

@@ -1,4 +1,4 @@
-// The current locale's country and the local time zone's offset. Any thread.
+// The country of the current locale, and the offset of the local time zone. Any thread.
 #pragma once
 
 #include <optional>
@@ -13,14 +13,14 @@ class FileStore;
 class Locale {
  public:
   virtual ~Locale() = default;
-  // "DE" for "de_DE.UTF-8"; nothing for "C", "POSIX" and names without a country.
+  // "DE" for "de_DE.UTF-8"; absent for "C", "POSIX" and names without a country.
   virtual std::optional<std::string> countryCode() = 0;
-  // Seconds east of GMT, now, daylight saving included.
+  // The current offset in seconds east of GMT, including daylight saving time.
   virtual int timeZoneOffset() = 0;
 };
 
-// The first that is set and not empty of LC_ALL, LC_MESSAGES, LANG, then "LANG" in the locale.conf given,
-// which is as it last was while it cannot be read for a shortage.
+// Uses the first of LC_ALL, LC_MESSAGES and LANG that is set and not empty, else "LANG" in the given
+// locale.conf. During a shortage, the value that was last read from the file is used.
 class EnvironmentLocale final : public Locale {
  public:
   EnvironmentLocale(FileStore& files, std::string localeConfigurationPath);
@@ -34,7 +34,7 @@ class EnvironmentLocale final : public Locale {
   std::optional<std::string> _last GUARDED_BY(_mutex);
 };
 
-// The country part of a locale name; exposed for its table of tests.
+// The country in a locale name. Exposed for tests.
 std::optional<std::string> countryOfLocaleName(const std::string& name);
 
 }  // namespace veltrad::platform

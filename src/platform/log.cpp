@@ -1,4 +1,4 @@
-// The one process-wide log: the journal, standard error or syslog. Any thread; a line is one system call.
+// Writes log lines to the journal, standard error or syslog. A line is one system call.
 #include "platform/log.h"
 
 #include <sys/stat.h>
@@ -30,19 +30,19 @@ std::atomic<int> threshold{static_cast<int>(LogLevel::info)};
 
 namespace {
 
-constexpr int kUserFacility = LOG_USER;
-constexpr std::size_t kMostJournalBytes = 48u << 10;  // what the journal takes of a line by default
+// The journal's default limit for a line.
+constexpr std::size_t kMostJournalBytes = 48u << 10;
 constexpr std::size_t kMostSyslogBytes = 4u << 10;
 
 struct Target {
   enum class Kind { standardError, terminal, journal, syslog };
   Kind kind = Kind::standardError;
-  std::string program;  // openlog() keeps a pointer to it
-  int facility = kUserFacility;
+  // openlog() keeps a pointer to it.
+  std::string program;
+  int facility = LOG_USER;
 };
 
-// A line may be written under any other lock, the leaves included: the sink's is held for two copies and
-// takes nothing.
+// A line may be written while any other lock is held, leaves included.
 constexpr LockRank kLogSinkRank{101};
 
 struct State {
@@ -52,25 +52,23 @@ struct State {
 };
 
 State& state() {
-  static State* const only = new State;  // never freed: threads may write lines until the process is gone
+  static State* const only = new State;  // never freed: threads may write lines until the process ends
   return *only;
 }
 
-const char* nameOf(LogLevel level) {
-  switch (level) {
-    case LogLevel::error:
-      return "error";
-    case LogLevel::warning:
-      return "warning";
-    case LogLevel::info:
-      return "info";
-    case LogLevel::debug:
-      return "debug";
+constexpr std::pair<LogLevel, std::string_view> kLevels[] = {{LogLevel::error, "error"},
+                                                             {LogLevel::warning, "warning"},
+                                                             {LogLevel::info, "info"},
+                                                             {LogLevel::debug, "debug"}};
+
+std::string nameOf(LogLevel level) {
+  for (const auto& [known, name] : kLevels) {
+    if (known == level) return std::string(name);
   }
   return "unknown";
 }
 
-// The beginning of an escaped line, and how much of it is missing, in `most` bytes.
+// Shortens an escaped line to `most` bytes, with a note on how many were cut.
 std::string cut(std::string_view line, std::size_t most) {
   if (line.size() <= most) return std::string(line);
   constexpr std::size_t kLongestNote = 40;
@@ -89,13 +87,12 @@ std::string localTime() {
   return text;
 }
 
-// At most PIPE_BUF bytes in one write, so that a pipe holds the line whole or not at all, whoever else
-// writes.
+// Writes at most PIPE_BUF bytes at once, so that lines of several processes are never mixed in a pipe.
 void writeToStandardError(const std::string& before, std::string_view line) {
   std::string text = before;
   text += cut(line, PIPE_BUF - before.size() - 1);
   text += '\n';
-  // Where it fails there is nobody left to tell.
+  // A failure cannot be reported anywhere.
   while (::write(STDERR_FILENO, text.data(), text.size()) < 0 && errno == EINTR) {
   }
 }
@@ -141,8 +138,8 @@ std::string formatted(const char* format, va_list arguments) {
 }
 
 bool standardErrorIsTheJournal() {
-  const char* named =
-      std::getenv("JOURNAL_STREAM");  // "DEVICE:INODE" of the stream that the service manager made
+  // "DEVICE:INODE" of the stream that the service manager made.
+  const char* named = std::getenv("JOURNAL_STREAM");
   struct stat status {};
   if (!named || ::fstat(STDERR_FILENO, &status) != 0) return false;
   return named == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
@@ -152,7 +149,7 @@ Target::Kind standardErrorKind() {
   return ::isatty(STDERR_FILENO) == 1 ? Target::Kind::terminal : Target::Kind::standardError;
 }
 
-// Absent: no such choice.
+// Absent if there is no such choice.
 std::optional<Target::Kind> kindForChoice(std::string_view choice) {
   if (choice == "auto") return standardErrorIsTheJournal() ? Target::Kind::journal : standardErrorKind();
   if (choice == "stderr") return standardErrorKind();
@@ -161,8 +158,8 @@ std::optional<Target::Kind> kindForChoice(std::string_view choice) {
 }
 
 std::optional<LogLevel> levelForName(std::string_view name) {
-  for (const LogLevel level : {LogLevel::error, LogLevel::warning, LogLevel::info, LogLevel::debug}) {
-    if (name == nameOf(level)) return level;
+  for (const auto& [level, known] : kLevels) {
+    if (known == name) return level;
   }
   return std::nullopt;
 }
@@ -213,8 +210,8 @@ void VeltraLogging::startLogging(std::string_view program, std::string_view faci
   const auto kind = log::kindForChoice(choice);
   const auto threshold = log::levelForName(level);
 
-  ::tzset();  // localtime_r alone does not read the zone
-  const int number = facility == "Daemon" ? LOG_DAEMON : log::kUserFacility;
+  ::tzset();  // localtime_r does not read the zone
+  const int number = facility == "Daemon" ? LOG_DAEMON : LOG_USER;
   auto target = std::make_shared<const Target>(
       Target{kind ? *kind : *log::kindForChoice("auto"), std::string(program), number});
   if (target->kind == Target::Kind::syslog) ::openlog(target->program.c_str(), LOG_PID, number);

@@ -1,11 +1,11 @@
-// The process's log: the one process-wide object. Any thread.
+// The process's log, usable from any thread.
 //
 //   logDebug("setSessionInfo: Configuring session %u", sessionID);
 //
-// The format is printf's, checked by the compiler, and stands in the code exactly as the user sees it. Below
-// the threshold a line costs one comparison and its arguments are not evaluated. A line is escaped as a whole
-// (base/text.h); one line break at its end is dropped. One that is longer than its target takes (PIPE_BUF on
-// standard error, 48 KiB in the journal) is cut, and says by how much.
+// The format is that of printf, checked by the compiler. A line below the threshold costs one comparison, and
+// its arguments are not evaluated. A line is escaped as a whole (base/text.h), one line break at its end is
+// dropped, and it is cut with a note if it is longer than its target takes (PIPE_BUF on standard error, 48
+// KiB in the journal).
 #pragma once
 
 #include <atomic>
@@ -19,14 +19,15 @@ enum class LogLevel : int { error = 3, warning = 4, info = 6, debug = 7 };
 
 namespace log {
 
-extern std::atomic<int> threshold;  // LogLevel's number; info at start
+// The number of a LogLevel; info at first.
+extern std::atomic<int> threshold;
 
 inline bool enabled(LogLevel level) {
   return static_cast<int>(level) <= threshold.load(std::memory_order_relaxed);
 }
 void write(LogLevel level, const char* format, ...) __attribute__((format(printf, 2, 3)));
 
-// Where lines go instead of the real log, already escaped; empty: back to the real log. For tests.
+// For tests: receives the escaped lines instead of the real log. An empty sink restores the real log.
 using Sink = std::function<void(LogLevel, std::string_view line)>;
 void setSink(Sink sink);
 
@@ -43,9 +44,9 @@ void setSink(Sink sink);
 
 class VeltraLogging {
  public:
-  // Opens the log under the program name ("veltrad") and facility ("Daemon"): the journal when the service
-  // manager connects standard error to it, else standard error. VELTRA_LOG_TARGET=auto|stderr|syslog and
-  // VELTRA_LOG=error|warning|info|debug are read here; an unknown value is one warning line that names the
+  // Opens the log with this program name and facility ("Daemon"). It is the journal if the service manager
+  // has connected standard error to it, else standard error. VELTRA_LOG_TARGET=auto|stderr|syslog and
+  // VELTRA_LOG=error|warning|info|debug override this; an unknown value is one warning line that names the
   // choices.
   static void startLogging(std::string_view program, std::string_view facility);
   static void stopLogging();

@@ -1,4 +1,4 @@
-// The machine's own files, read at each question. Any thread.
+// Facts from the machine's files.
 #include "platform/machine_facts.h"
 
 #include <openssl/evp.h>
@@ -36,39 +36,16 @@ std::optional<std::string> deviceNameOfChassis(std::string_view chassis) {
 }  // namespace
 
 std::optional<std::string> deviceNameOfChassisType(int type) {
-  switch (type & 0x7f) {  // the highest bit tells of a lock
-    case 3:
-    case 4:
-    case 6:
-    case 7:
-    case 13:
-    case 24:
-    case 35:
-    case 36:
-      return "Desktop";
-    case 8:
-    case 9:
-    case 10:
-    case 14:
-    case 31:
-    case 32:
-      return "Laptop";
-    case 11:
-      return "Handset";
-    case 17:
-    case 23:
-    case 25:
-    case 28:
-    case 29:
-      return "Server";
-    case 30:
-      return "Tablet";
-    case 33:
-    case 34:
-      return "Embedded";
-    default:
-      return std::nullopt;
+  static constexpr std::pair<int, const char*> kNames[] = {
+      {3, "Desktop"},  {4, "Desktop"},   {6, "Desktop"},   {7, "Desktop"},  {8, "Laptop"},   {9, "Laptop"},
+      {10, "Laptop"},  {11, "Handset"},  {13, "Desktop"},  {14, "Laptop"},  {17, "Server"},  {23, "Server"},
+      {24, "Desktop"}, {25, "Server"},   {28, "Server"},   {29, "Server"},  {30, "Tablet"},  {31, "Laptop"},
+      {32, "Laptop"},  {33, "Embedded"}, {34, "Embedded"}, {35, "Desktop"}, {36, "Desktop"},
+  };
+  for (const auto& [number, name] : kNames) {
+    if (number == (type & 0x7f)) return name;  // the highest bit says whether there is a lock
   }
+  return std::nullopt;
 }
 
 std::optional<std::string> MachineFacts::contents(const char* path) {
@@ -77,11 +54,8 @@ std::optional<std::string> MachineFacts::contents(const char* path) {
     if (bytes.error().passes() && !_shortage) _shortage = bytes.error();
     return std::nullopt;
   }
-  static constexpr std::string_view kBlanks(" \t\r\n\0", 5);
-  const std::string& text = bytes.value();
-  const auto begin = text.find_first_not_of(kBlanks);
-  if (begin == std::string::npos) return std::nullopt;
-  return toUTF8(std::string_view(text).substr(begin, text.find_last_not_of(kBlanks) - begin + 1));
+  const std::string_view text = trimmed(bytes.value(), {" \t\r\n\0", 5});
+  return text.empty() ? std::nullopt : std::optional(toUTF8(text));
 }
 
 std::optional<std::string> MachineFacts::fromOSRelease(const char* name) {
@@ -89,10 +63,6 @@ std::optional<std::string> MachineFacts::fromOSRelease(const char* name) {
     if (const auto text = contents(path)) return valueInEnvironmentFile(*text, name);
   }
   return std::nullopt;
-}
-
-std::optional<std::string> MachineFacts::productVersion() {
-  return fromOSRelease("VERSION_ID");
 }
 
 std::optional<std::string> MachineFacts::buildVersion() {
@@ -105,14 +75,6 @@ std::optional<std::string> MachineFacts::productType() {
   return contents("/proc/device-tree/model");
 }
 
-std::optional<std::string> MachineFacts::hardwareModel() {
-  return contents("/sys/class/dmi/id/board_name");
-}
-
-std::optional<std::string> MachineFacts::serialNumber() {
-  return contents("/sys/class/dmi/id/product_serial");
-}
-
 std::optional<std::string> MachineFacts::uniqueDeviceID() {
   const auto machineID = contents("/etc/machine-id");
   if (!machineID || !isMachineID(*machineID)) return std::nullopt;
@@ -123,7 +85,7 @@ std::optional<std::string> MachineFacts::uniqueDeviceID() {
   return hex({reinterpret_cast<const char*>(digest), 20});
 }
 
-// Existence is asked alone: the sandbox lets nobody open what this is asked of.
+// Does not open the file, which the sandbox would not allow.
 bool MachineFacts::exists(const char* path) {
   const auto stamp = _files.stamp(path);
   if (!stamp && !_shortage) _shortage = stamp.error();

@@ -1,4 +1,4 @@
-// What the machine says of itself: os-release, DMI, device tree, machine id. One thread; made for a question.
+// Facts about the machine from os-release, DMI, the device tree and the machine id.
 #pragma once
 
 #include <optional>
@@ -8,29 +8,32 @@
 
 namespace veltrad::platform {
 
-// Each reads the host's own files afresh through `files`; nothing where the machine does not say. What was
-// answered while `shortage()` tells of one is no answer.
+// Each function reads the host's files again; absent if the machine does not state the fact. To be made for
+// one question: after a shortage, the result is not reliable.
 class MachineFacts {
  public:
   explicit MachineFacts(FileStore& files) : _files(files) {}
 
-  // The first file that could not be looked at just now.
+  // The first file that could not be read because of a shortage.
   const std::optional<FileFailure>& shortage() const { return _shortage; }
 
-  std::optional<std::string> productVersion();  // VERSION_ID
-  std::optional<std::string> buildVersion();    // BUILD_ID, else the kernel's release
-  std::optional<std::string> productType();     // DMI's product name, else the device tree's model
-  // "Desktop", "Laptop", "Server", "Tablet", "Handset", "Embedded", "Watch", "VM", "Container"; never
-  // nothing: "Computer" where nothing is known.
+  std::optional<std::string> productVersion() { return fromOSRelease("VERSION_ID"); }
+  // BUILD_ID, else the kernel's release.
+  std::optional<std::string> buildVersion();
+  // DMI's product name, else the device tree's model.
+  std::optional<std::string> productType();
+  // "Desktop", "Laptop", "Server", "Tablet", "Handset", "Embedded", "Watch", "VM", "Container" or, if nothing
+  // is known, "Computer".
   std::string deviceName();
-  std::optional<std::string> hardwareModel();  // DMI's board name
-  std::optional<std::string> serialNumber();   // DMI's product serial, which only root may read
-  // The first 40 hexadecimal digits of SHA-256 over a text of our own and the machine id: the id cannot be
-  // told from it, and no other program derives the same.
+  std::optional<std::string> hardwareModel() { return contents("/sys/class/dmi/id/board_name"); }
+  // Readable only by root.
+  std::optional<std::string> serialNumber() { return contents("/sys/class/dmi/id/product_serial"); }
+  // The first 40 hexadecimal digits of SHA-256 over a salt and the machine id, so that the id cannot be
+  // derived from it.
   std::optional<std::string> uniqueDeviceID();
 
  private:
-  // Without blanks and NULs at either end; nothing when that leaves nothing.
+  // Without blanks and NULs at either end; absent if empty.
   std::optional<std::string> contents(const char* path);
   std::optional<std::string> fromOSRelease(const char* name);
   bool exists(const char* path);
@@ -41,8 +44,7 @@ class MachineFacts {
   std::optional<FileFailure> _shortage;
 };
 
-// By SMBIOS chassis type, as the firmware numbers them; nothing for types that tell
-// nothing.
+// The name for an SMBIOS chassis type; absent for types that say nothing.
 std::optional<std::string> deviceNameOfChassisType(int type);
 
 }  // namespace veltrad::platform

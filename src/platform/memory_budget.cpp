@@ -1,4 +1,4 @@
-// The accounts' arithmetic, and who makes room for whom. Any thread.
+// Memory accounts: their sums, waiting for memory, and dropping what may be dropped.
 #include "platform/memory_budget.h"
 
 #include <chrono>
@@ -18,18 +18,9 @@ bool takeFrom(std::atomic<std::size_t>& sum, std::size_t bytes, std::size_t boun
   return true;
 }
 
-// Of the five sums of take(), so many concern each use.
-std::size_t sumsOf(MemoryUse use) {
-  switch (use) {
-    case MemoryUse::working:
-      return 2;
-    case MemoryUse::kept:
-      return 4;
-    case MemoryUse::unfinished:
-      return 5;
-  }
-  return 5;
-}
+// How many of the five sums of take() concern each MemoryUse.
+constexpr std::size_t kSums[] = {2, 4, 5};
+static_assert(std::size(kSums) == static_cast<std::size_t>(MemoryUse::unfinished) + 1);
 
 }  // namespace
 
@@ -77,7 +68,7 @@ bool MemoryAccount::take(std::size_t bytes, MemoryUse use) {
               {_kept, bounds.userKept},
               {_totals->kept, bounds.allKept},
               {_unfinished, bounds.userUnfinished}};
-  const std::size_t count = sumsOf(use);
+  const std::size_t count = kSums[static_cast<std::size_t>(use)];
   for (std::size_t i = 0; i < count; ++i) {
     if (takeFrom(sums[i].sum, bytes, sums[i].bound)) continue;
     while (i > 0) sums[--i].sum.fetch_sub(bytes);
@@ -95,7 +86,7 @@ void MemoryAccount::giveBack(std::size_t bytes, MemoryUse use) {
   _totals->used.fetch_sub(bytes);
   _used.fetch_sub(bytes);
   if (_totals->waiting.load() == 0) return;
-  // Who waits has looked under the lock, so the news cannot pass between the look and the wait.
+  // Waiting threads check under the lock, so none of them misses this.
   const Lock held(_totals->mutex);
   _totals->changed.notifyAll();
 }

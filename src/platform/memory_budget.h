@@ -1,4 +1,5 @@
-// What the daemon keeps for its clients, in bytes: one account for each user id, one sum for all. Any thread.
+// Accounts of the memory that the daemon keeps for its clients: one for each user id, and a total. Any
+// thread.
 #pragma once
 
 #include <atomic>
@@ -17,20 +18,21 @@ namespace veltrad::platform {
 class MemoryAccount;
 
 struct MemoryBounds {
-  std::size_t user = 56u << 20;            // of one user id, in all
-  std::size_t userKept = 40u << 20;        // of these, what outlives the call that made it
-  std::size_t userUnfinished = 24u << 20;  // of these again, frames that have not come whole
-  std::size_t all = 256u << 20;            // of all user ids together
+  // Of one user id: in all; of these, what outlives the call that made it; of these, unfinished frames.
+  std::size_t user = 56u << 20;
+  std::size_t userKept = 40u << 20;
+  std::size_t userUnfinished = 24u << 20;
+  // Of all user ids together.
+  std::size_t all = 256u << 20;
   std::size_t allKept = 192u << 20;
 };
 
-enum class MemoryUse {
-  working,     // ends by itself: a call that runs, an upload
-  kept,        // outlives its call: batches, posts, copies that wait, lingering dashboards
-  unfinished,  // kept, too: the bytes of a frame that its client may never finish
-};
+// working: ends by itself, such as a running call or an upload. kept: outlives its call, such as batches,
+// posts, waiting copies and lingering dashboards. unfinished: kept bytes of a frame that its client may never
+// finish.
+enum class MemoryUse { working, kept, unfinished };
 
-// Bytes of an account, paid back by the object that frees the memory. An empty one holds nothing.
+// A number of bytes charged to an account, released by the object that frees the memory.
 class Charge {
  public:
   Charge() = default;
@@ -39,10 +41,10 @@ class Charge {
   ~Charge() { release(); }
 
   std::size_t bytes() const { return _bytes; }
-  // False: there is no room for more, and nothing has changed. Less is always possible. Of an empty charge:
-  // false unless `bytes` is 0.
+  // False if the account has no room for more; then nothing has changed. Shrinking always succeeds. A charge
+  // without an account can only be resized to 0.
   [[nodiscard]] bool resize(std::size_t bytes);
-  // Takes over the other's bytes, which are of the same account and use.
+  // Takes over the bytes of a charge of the same account and use.
   void add(Charge other);
   void release();
 
@@ -56,20 +58,20 @@ class Charge {
   MemoryUse _use = MemoryUse::working;
 };
 
-// Something that is kept and may be given up for newer things of the same user, oldest first.
+// Something whose parts may be dropped, oldest first, for newer data of the same user.
 class Evictable {
  public:
   virtual ~Evictable() = default;
-  // The turn (MemoryAccount::nextTurn) of its oldest part; nothing: it holds none.
+  // The turn (MemoryAccount::nextTurn) of its oldest part; absent if it has none.
   virtual std::optional<std::uint64_t> oldestTurn() const = 0;
   // Drops and counts that part.
   virtual void dropOldest() = 0;
 };
 
-// Of those who wait for memory, which is paid back under any lock, the log sink's included.
+// Above all other ranks, because memory is released under any lock.
 inline constexpr LockRank kMemoryRank{102};
 
-// The sums of all user ids. Outlives its accounts' charges through them.
+// The sums over all user ids, shared by the accounts.
 class MemoryTotals {
  public:
   explicit MemoryTotals(MemoryBounds bounds) : bounds(bounds) {}
@@ -77,31 +79,33 @@ class MemoryTotals {
   const MemoryBounds bounds;
   std::atomic<std::size_t> used{0};
   std::atomic<std::size_t> kept{0};
-  std::atomic<std::size_t> waiting{0};  // threads in waitToCharge()
+  // Threads in waitToCharge().
+  std::atomic<std::size_t> waiting{0};
   Mutex mutex LEAF_LOCK{kMemoryRank};
   Condition changed;
 };
 
-// One user id. Its locks are leaves; evictables are called without any.
+// The account of one user id. Its locks are leaves; evictables are called without holding any.
 class MemoryAccount : public std::enable_shared_from_this<MemoryAccount> {
  public:
   MemoryAccount(unsigned uid, std::shared_ptr<MemoryTotals> totals) : _uid(uid), _totals(std::move(totals)) {}
 
   unsigned uid() const { return _uid; }
   std::size_t used() const { return _used.load(std::memory_order_relaxed); }
-  // True when unfinished frames alone leave no room for so many bytes more: no use to wait for it.
+  // True if unfinished frames alone leave no room for `bytes` more, so that waiting is useless.
   bool unfinishedFull(std::size_t bytes) const;
 
-  // Nothing: no room.
+  // These return nothing, or false, if there is no room.
+
   std::optional<Charge> tryCharge(std::size_t bytes, MemoryUse use);
-  // Kept bytes, for which the user's oldest evictable parts make room where they can. Nothing: no room.
+  // Charges kept bytes; drops the user's oldest evictable parts to make room.
   std::optional<Charge> keep(std::size_t bytes);
-  // The same for a charge that grows; false: no room, and nothing has changed but what made room.
+  // The same for a charge that grows.
   bool keepMore(Charge& charge, std::size_t bytes);
-  // Of the account's evictables the oldest part goes. False: there is none.
+  // Drops the oldest part of the account's evictables. False if there is none.
   bool dropOldest();
-  // Working bytes; waits until there is room, as long as `giveUp` (asked every tenth of a second) is false.
-  // The caller holds no other working charge, or two such callers may wait for each other.
+  // Charges working bytes. Waits for room until `giveUp`, which is called every tenth of a second, returns
+  // true. The caller must not hold another working charge, or two callers could wait for each other.
   std::optional<Charge> waitToCharge(std::size_t bytes, const std::function<bool()>& giveUp);
 
   void add(const std::shared_ptr<Evictable>& evictable);
@@ -123,7 +127,7 @@ class MemoryAccount : public std::enable_shared_from_this<MemoryAccount> {
   std::vector<std::weak_ptr<Evictable>> _evictables GUARDED_BY(_mutex);
 };
 
-// Finds a user id's account, which lives as long as somebody holds it.
+// Finds a user id's account, which exists as long as somebody holds it.
 class MemoryBudget {
  public:
   explicit MemoryBudget(MemoryBounds bounds = {}) : _totals(std::make_shared<MemoryTotals>(bounds)) {}

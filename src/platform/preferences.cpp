@@ -1,4 +1,4 @@
-// Preference domains as property list files. Any thread; the lock is held around read, change and rename.
+// Preference domains as property list files.
 #include "platform/preferences.h"
 
 #include <utility>
@@ -52,17 +52,6 @@ Preferences::Found FilePreferences::lookUp(std::string_view domain, std::string_
   return found;
 }
 
-bool FilePreferences::setValue(std::string_view domain, std::string_view key, const Value& value) {
-  Complaints complaints;
-  bool stored = false;
-  {
-    Lock lock(_mutex);
-    stored = store(domain, key, value, complaints);
-  }
-  logAll(complaints);
-  return stored;
-}
-
 Result<Done, std::string> FilePreferences::change(std::string_view domain, std::string_view key,
                                                   const std::optional<Value>& value) {
   Complaints complaints;
@@ -88,7 +77,7 @@ std::optional<std::string> FilePreferences::textOrStore(std::string_view domain,
     if (!text || text->empty()) {
       const std::string name = nameOf(domain, key);
       const std::string* unstored = _unstored.string(name);
-      Complaints said;  // once, when it was made
+      Complaints said;  // not logged: this was done when the text was made
       if (unstored) {
         text = *unstored;
         if (store(domain, key, *text, said)) _unstored.erase(name);
@@ -110,7 +99,7 @@ std::string FilePreferences::pathOf(std::string_view domain) const {
 
 Result<Dictionary, FileFailure> FilePreferences::known(std::string_view domain, Complaints& complaints) {
   const std::string path = pathOf(domain);
-  const auto stamp = _files.stamp(path);  // first: a file that changes while it is read is not known
+  const auto stamp = _files.stamp(path);  // first, so that a file that changes while it is read is read again
   auto all = read(domain, complaints);
   if (all) {
     if (stamp) {
@@ -140,11 +129,11 @@ Result<Dictionary, FileFailure> FilePreferences::read(std::string_view domain, C
   const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* all = list ? list.value().asDictionary() : nullptr;
   if (all) return *all;
-  const std::string why = list ? "the outermost value is not a dictionary" : list.error().detail;
+  const std::string why = list ? "the outermost value is not a dictionary" : list.error().description();
   return refused(path, {FileFailure::Kind::other, path + ": " + why}, true, complaints);
 }
 
-// What serves instead of the file: an empty domain once it was put aside, else nothing.
+// The content that replaces an unusable file: an empty domain if the file was put aside, else a failure.
 Result<Dictionary, FileFailure> FilePreferences::refused(const std::string& path, FileFailure why,
                                                          bool putAside, Complaints& complaints) {
   const auto stamp = _files.stamp(path);

@@ -1,4 +1,4 @@
-// Preference domains: DOMAIN.plist under var/lib/veltrad/preferences, read at use. Any thread.
+// Preference domains: DOMAIN.plist under var/lib/veltrad/preferences, read at each use. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -20,32 +20,29 @@ inline constexpr std::string_view kVeltraPreferenceDomain = "com.florn.veltra";
 class Preferences {
  public:
   virtual ~Preferences() = default;
-  // Nothing stored: nothing. A failure is a shortage: for now nobody can say.
+  // Absent if nothing is stored. A failure is a shortage: it cannot be determined now.
   using Found = Result<std::optional<Value>, FileFailure>;
   virtual Found lookUp(std::string_view domain, std::string_view key) = 0;
-  // False when it could not be stored; one error line has said why.
-  virtual bool setValue(std::string_view domain, std::string_view key, const Value& value) = 0;
-  // The text under the key, or `make()` stored there; one hold of the lock, so two callers get one text. When
-  // the store cannot be written, the text lasts as long as the process, and each call tries to store it
-  // again. Nothing: for a shortage nobody can say what is stored, so nothing was made.
+  // The text under the key or, if there is none, `make()`, which is stored there; concurrent callers get the
+  // same text. If it cannot be stored, it is kept until the process ends, and each call tries to store it
+  // again. Absent during a shortage, when it cannot be determined what is stored.
   virtual std::optional<std::string> textOrStore(std::string_view domain, std::string_view key,
                                                  std::string (*make)()) = 0;
 
-  // Nothing also where nobody can say for now.
+  // Absent also during a shortage.
   std::optional<Value> value(std::string_view domain, std::string_view key);
-  // A stored number or boolean yields its decimal text.
+  // The same as a text; numbers and booleans are converted.
   std::optional<std::string> text(std::string_view domain, std::string_view key);
 };
 
-// Either property list form is read; the binary form is written. A file that is too large, malformed or
-// closed to the daemon is renamed to DOMAIN.plist.corrupt, defaults serve and one error line says so. One
-// that cannot be read for another reason stays: one error line, defaults serve, nothing is stored over it.
-// During a shortage what was last read serves where the file has not changed since.
+// Reads either form of property lists and writes the binary one. A file that is too large, malformed or not
+// accessible is renamed to DOMAIN.plist.corrupt, with one error line, and defaults apply. A file that cannot
+// be read for another lasting reason stays and is not overwritten; one error line, and defaults apply. During
+// a shortage, the last content that was read is used if the file has not changed since.
 class FilePreferences final : public Preferences {
  public:
   FilePreferences(FileStore& files, std::string directory);
   Found lookUp(std::string_view domain, std::string_view key) override;
-  bool setValue(std::string_view domain, std::string_view key, const Value& value) override;
   std::optional<std::string> textOrStore(std::string_view domain, std::string_view key,
                                          std::string (*make)()) override;
   // Stores the value, or takes the key away where there is none; other keys stay. The error is one line,
@@ -54,11 +51,12 @@ class FilePreferences final : public Preferences {
                                    const std::optional<Value>& value);
 
  private:
-  using Complaints = std::vector<std::string>;  // error lines, logged when the lock is released
-  // The file as it is now.
+  // Error lines, logged after the lock was released.
+  using Complaints = std::vector<std::string>;
+  // The file's current content.
   Result<Dictionary, FileFailure> read(std::string_view domain, Complaints& complaints) REQUIRES(_mutex);
-  // What callers are answered from: during a shortage the content that is known to be the file's, and where
-  // it cannot be read for a lasting reason, nothing.
+  // The same; during a shortage the last content if it is still current, and empty if the file cannot be read
+  // for a lasting reason.
   Result<Dictionary, FileFailure> known(std::string_view domain, Complaints& complaints) REQUIRES(_mutex);
   Result<Dictionary, FileFailure> refused(const std::string& path, FileFailure failure, bool putAside,
                                           Complaints& complaints) REQUIRES(_mutex);
@@ -70,13 +68,15 @@ class FilePreferences final : public Preferences {
 
   FileStore& _files;
   const std::string _directory;
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // around read, change, rename
+  // Held while a file is read, changed and renamed.
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   struct Content {
     FileStamp stamp;
     Dictionary all;
   };
-  std::map<std::string, Content> _lastRead GUARDED_BY(_mutex);  // by path
-  // "DOMAIN KEY" of texts that could not be stored.
+  // By path.
+  std::map<std::string, Content> _lastRead GUARDED_BY(_mutex);
+  // The texts that could not be stored, under "DOMAIN KEY".
   Dictionary _unstored GUARDED_BY(_mutex);
   // By path: the stamp of the file that the last error line was about.
   std::map<std::string, FileStamp> _complained GUARDED_BY(_mutex);

@@ -1,4 +1,4 @@
-// Descriptors, environment and the guard of the exit. Main thread, before any other exists.
+// Standard descriptors, the environment, and the guard against exit().
 #include "platform/process_start.h"
 
 #include <fcntl.h>
@@ -30,7 +30,7 @@ extern "C" void refuseExit() {
 void openStandardDescriptors() {
   for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor) {
     if (::fcntl(descriptor, F_GETFD) >= 0 || errno != EBADF) continue;
-    // The lowest free number is this one: those below are open.
+    // It gets this number, the lowest free one: those below are open.
     if (::open("/dev/null", descriptor == STDIN_FILENO ? O_RDONLY : O_WRONLY) != descriptor) std::abort();
   }
 }
@@ -50,7 +50,7 @@ void forbidExit() {
   renewExitGuard();
 }
 
-// What was registered last runs first.
+// Handlers run in reverse order of their registration.
 void renewExitGuard() {
   if (!exitForbidden.load()) return;
   std::atexit(refuseExit);

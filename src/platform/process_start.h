@@ -1,5 +1,4 @@
-// What a daemon's process must be before anything else runs in it, and how alone it may end. Main thread,
-// before any other exists.
+// Prepares the daemon's process and guards its end. Main thread, before any other thread exists.
 #pragma once
 
 #include <optional>
@@ -7,19 +6,18 @@
 
 namespace veltrad::platform {
 
-// Opens /dev/null as each of the descriptors 0 to 2 that the caller has closed: the next file that is opened
-// would be taken for one of them.
+// Opens /dev/null for each closed descriptor from 0 to 2; otherwise the next file that is opened would get
+// its number.
 void openStandardDescriptors();
 
-// Removes every environment variable but those whose names are given: libraries read theirs at any time, and
-// some of them load code.
+// Removes all other environment variables, because libraries read theirs at any time and some load code.
 void keepEnvironment(std::initializer_list<std::string_view> names);
 
-// From now on exit() and quick_exit(), whoever calls them, end the process with status 1 and one error line,
-// until allowExit(): only an ordered end may have status 0. _exit() and a signal are beyond it.
+// Until allowExit(), exit() and quick_exit() end the process with status 1 and one error line, whoever calls
+// them. _exit() and signals are not affected.
 void forbidExit();
-// Once code was loaded, so that the guard runs before what that has registered. Nothing while exits are
-// allowed.
+// To be called after code was loaded, so that the guard runs before the handlers that this code registered.
+// Does nothing while exits are allowed.
 void renewExitGuard();
 void allowExit();
 

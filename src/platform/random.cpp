@@ -1,4 +1,4 @@
-// The 48-bit linear congruential sequence, started from zero. Any thread.
+// The 48-bit linear congruential sequence, starting from zero.
 #include "platform/random.h"
 
 #include <stdlib.h>

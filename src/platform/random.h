@@ -1,4 +1,4 @@
-// The process's uniform random draws. Any thread.
+// The process's uniform random numbers, for any thread.
 #pragma once
 
 #include "base/mutex.h"
@@ -8,10 +8,11 @@ namespace veltrad::platform {
 class Random {
  public:
   virtual ~Random() = default;
-  virtual double uniform() = 0;  // in [0, 1)
+  // In [0, 1).
+  virtual double uniform() = 0;
 };
 
-// The sequence of drand48 never seeded, from a state of our own: every daemon draws alike after a start.
+// The sequence of an unseeded drand48, with a state of its own: the same numbers after every start.
 class UnseededSequence final : public Random {
  public:
   double uniform() override;

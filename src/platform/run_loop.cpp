@@ -1,4 +1,4 @@
-// The main run loop over a signal descriptor and a wake-up descriptor. Main thread; stop() from any.
+// The main run loop, which waits on a signal descriptor and a wake-up descriptor.
 #include "platform/run_loop.h"
 
 #include <poll.h>
@@ -37,57 +37,62 @@ void letASecondSignalEndTheProcess() {
   ::pthread_sigmask(SIG_UNBLOCK, &ending, nullptr);
 }
 
-// The signal that ends the loop, when one has come. SIGHUP asks for nothing: files are reread when they
-// change.
-std::optional<int> endingSignal(int descriptor) {
+struct Signals {
+  std::optional<int> ending;
+  bool hangUp = false;
+};
+
+// Those that have come.
+Signals signalsIn(int descriptor) {
+  Signals come;
   signalfd_siginfo information{};
-  while (::read(descriptor, &information, sizeof information) == static_cast<ssize_t>(sizeof information)) {
+  while (!come.ending &&
+         ::read(descriptor, &information, sizeof information) == static_cast<ssize_t>(sizeof information)) {
     const int signal = static_cast<int>(information.ssi_signo);
-    if (signal == SIGTERM || signal == SIGINT) return signal;
+    if (signal == SIGHUP) come.hangUp = true;
+    if (signal == SIGTERM || signal == SIGINT) come.ending = signal;
   }
-  return std::nullopt;
+  return come;
 }
 
 }  // namespace
 
 RunLoop::RunLoop() : _wakeup(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-  if (_wakeup < 0) std::abort();
-}
-
-RunLoop::~RunLoop() {
-  ::close(_wakeup);
-  if (_signals >= 0) ::close(_signals);
+  if (!_wakeup.isOpen()) std::abort();
 }
 
 void RunLoop::blockSignals() {
   ::signal(SIGPIPE, SIG_IGN);
-  ::signal(SIGXFSZ, SIG_IGN);  // a file that may not grow is an error of the write
+  ::signal(SIGXFSZ, SIG_IGN);  // the write then fails
   const sigset_t set = setOf({SIGTERM, SIGINT, SIGHUP});
   ::pthread_sigmask(SIG_BLOCK, &set, nullptr);
-  if (_signals < 0) _signals = ::signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK);
-  if (_signals < 0) std::abort();
+  _signals.reset(::signalfd(-1, &set, SFD_CLOEXEC | SFD_NONBLOCK));
+  if (!_signals.isOpen()) std::abort();
 }
 
-int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>& tick) {
+int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>& tick,
+                 const std::function<void()>& hangUp) {
   using SteadyClock = std::chrono::steady_clock;
   auto next = SteadyClock::now() + interval;
   int signal = 0;
   while (true) {
-    pollfd descriptors[] = {{_signals, POLLIN, 0}, {_wakeup, POLLIN, 0}};
+    pollfd descriptors[] = {{_signals.get(), POLLIN, 0}, {_wakeup.get(), POLLIN, 0}};
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(next - SteadyClock::now()).count();
     const int ready = ::poll(descriptors, std::size(descriptors),
                              static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000)));
     if (ready < 0 && errno != EINTR) std::abort();
     if (ready > 0 && descriptors[0].revents != 0) {
-      if (const auto ending = endingSignal(_signals)) {
-        signal = *ending;
+      const Signals come = signalsIn(_signals.get());
+      if (come.ending) {
+        signal = *come.ending;
         break;
       }
+      if (come.hangUp) hangUp();
     }
     if (ready > 0 && descriptors[1].revents != 0) break;
     if (SteadyClock::now() < next) continue;
     tick();
-    next = std::max(next + interval, SteadyClock::now());  // a late tick is not made up for by several
+    next = std::max(next + interval, SteadyClock::now());  // missed ticks are not repeated
   }
   letASecondSignalEndTheProcess();
   return signal;
@@ -95,8 +100,8 @@ int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>
 
 void RunLoop::stop() {
   const std::uint64_t one = 1;
-  // The counter is full only where a wake-up is waiting already.
-  if (::write(_wakeup, &one, sizeof one) < 0 && errno != EAGAIN) std::abort();
+  // EAGAIN: a wake-up is pending already.
+  if (::write(_wakeup.get(), &one, sizeof one) < 0 && errno != EAGAIN) std::abort();
 }
 
 }  // namespace veltrad::platform

@@ -1,4 +1,4 @@
-// The daemon's sandbox profile and how it is entered. Main thread, before any other exists.
+// The daemon's sandbox profile, and entering it.
 #include "platform/sandbox.h"
 
 #include <fcntl.h>
@@ -21,7 +21,7 @@ namespace veltrad::platform {
 namespace {
 
 constexpr std::uint64_t kRead = landlock::kReadFile | landlock::kReadDirectory;
-// No kRefer: files are renamed within their directory. Nothing holds kExecute: no program runs.
+// Without kRefer, because files are renamed within their directory. No rule grants kExecute.
 constexpr std::uint64_t kWrite = kRead | landlock::kWriteFile | landlock::kTruncate | landlock::kRemoveFile |
                                  landlock::kRemoveDirectory | landlock::kMakeDirectory |
                                  landlock::kMakeRegularFile | landlock::kMakeSocket;
@@ -35,7 +35,7 @@ struct Outcome {
   int missing = 0;
 };
 
-// Nothing, or the failure text.
+// Returns the failure text, if any.
 std::optional<std::string> addRules(int ruleset, const std::vector<std::string>& paths, std::uint64_t allowed,
                                     Outcome& outcome) {
   for (const std::string& path : paths) {
@@ -73,12 +73,7 @@ Result<SandboxState, std::string> restrict(const SandboxProfile& profile, int ab
                                 " missing and left out; no program runs, no new privileges"};
 }
 
-}  // namespace
-
-namespace {
-
-// What an administrator puts there later must be readable then, so where the directory is missing the rule
-// stands on the nearest one above that exists; never on "/".
+// The nearest existing directory, so that files that are added later can be read; never "/".
 std::string itselfOrNearestAbove(const std::string& path) {
   std::string place = path;
   struct stat status {};
@@ -98,11 +93,11 @@ SandboxProfile veltradSandboxProfile(const Root& root) {
       "com.florn.veltrad",
       {itselfOrNearestAbove(root.configurationDirectory()), itselfOrNearestAbove(root.resourcesDirectory()),
        root.adaptorBundleDirectory(), root.localeConfigurationPath(),
-       // The host's own: names and certificates, zones, libraries that those load, what the machine says.
+       // Of the host: names, certificates, time zones, libraries, facts about the machine.
        "/etc", "/proc", "/sys/class/dmi", "/sys/devices/virtual/dmi", "/sys/firmware/devicetree", "/usr/lib",
        "/usr/lib64", "/usr/local/lib", "/lib", "/lib64", "/usr/share/zoneinfo", "/usr/share/ca-certificates",
        "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
-      {root.preferencesDirectory(), root.logsDirectory(), root.runDirectory(),
+      {root.stateDirectory(), root.logsDirectory(), root.runDirectory(),
        messageLog.substr(0, messageLog.rfind('/'))}};
 }
 

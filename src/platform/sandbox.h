@@ -1,5 +1,5 @@
-// The sandbox profile: Landlock and no-new-privileges. Main thread, before any other thread exists: the rules
-// bind the calling thread and those that it starts later.
+// The sandbox: Landlock and no-new-privileges. To be entered on the main thread before any other thread
+// exists, because the rules apply only to the calling thread and those that it starts later.
 #pragma once
 
 #include <string>
@@ -12,21 +12,24 @@ namespace veltrad::platform {
 class Root;
 
 struct SandboxProfile {
-  std::string name;                // "com.florn.veltrad"
-  std::vector<std::string> read;   // files or directories, whole trees
-  std::vector<std::string> write;  // directories: make, write, rename, remove, and read
+  std::string name;
+  // Files, or directories with all that is below.
+  std::vector<std::string> read;
+  // Directories in which files may also be made, written, renamed and removed.
+  std::vector<std::string> write;
 };
 
-// The profile "com.florn.veltrad" for this root: see docs/architecture.md.
+// The profile "com.florn.veltrad": see docs/architecture.md.
 SandboxProfile veltradSandboxProfile(const Root& root);
 
-// Enters it. Value: one line that says what is in force. A missing path leaves its rule out, rights that the
-// kernel does not know are left out. A kernel without Landlock: `inForce` false and the line says so; with
-// VELTRA_SANDBOX=required, and when the kernel refuses, an error with the failure text.
 struct SandboxState {
   bool inForce;
+  // Says what is in force.
   std::string line;
 };
+// Enters the sandbox. Missing paths, and rights that the kernel does not know, are left out. Without Landlock
+// in the kernel, `inForce` is false, or with VELTRA_SANDBOX=required this is an error. The error is a failure
+// text.
 Result<SandboxState, std::string> enterSandbox(const SandboxProfile& profile);
 
 }  // namespace veltrad::platform

@@ -1,5 +1,4 @@
-// Scheduling class and limits, by system call. A refusal changes nothing that a user would notice, so none is
-// reported.
+// Scheduling class, heaps and limits. Failures are ignored, because no user would notice them.
 #include "platform/scheduling.h"
 
 #include <malloc.h>
@@ -14,7 +13,7 @@ namespace veltrad::platform {
 namespace {
 constexpr int kUtilityNice = 5;
 constexpr int kIOPriorityWhoProcess = 1;
-constexpr int kIOPriorityBestEffort = 2 << 13;  // the class in the upper bits, the level 0 to 7 in the lower
+constexpr int kIOPriorityBestEffort = 2 << 13;  // the level, 0 to 7, is in the lower bits
 constexpr int kUtilityIOLevel = 6;
 }  // namespace
 
@@ -27,7 +26,7 @@ void takeUtilitySchedulingClass() {
 
 void shareHeaps() {
   mallopt(M_ARENA_MAX, 2);
-  // A large block goes back to the system when it is freed; glibc would raise the threshold with each.
+  // Large blocks are returned when they are freed; otherwise glibc would raise the threshold with each.
   mallopt(M_MMAP_THRESHOLD, 256 << 10);
 }
 

@@ -1,17 +1,16 @@
-// Scheduling class, heaps and limits of the process. Main thread, before any other thread exists: later
-// threads inherit.
+// Scheduling class, heaps and limits of the process. To be set on the main thread before any other exists,
+// because threads inherit them.
 #pragma once
 
 namespace veltrad::platform {
 
-// Work that somebody awaits, but not at once: nice 5 at least, I/O in the lower half of the best-effort
-// class.
+// At least nice 5, and I/O in the lower half of the best-effort class.
 void takeUtilitySchedulingClass();
-// Two heaps for all threads instead of eight a core: a daemon of many small threads keeps its memory small.
+// Limits malloc to two heaps instead of eight for each core, which saves memory with many small threads.
 void shareHeaps();
-// What the heaps keep for later goes back to the system; costs a walk over them.
+// Returns free memory to the system; takes time in proportion to the size of the heaps.
 void returnFreeMemory();
-// The soft limit on descriptors up to the hard one.
+// Raises the soft limit on descriptors to the hard one.
 void raiseDescriptorLimit();
 
 }  // namespace veltrad::platform

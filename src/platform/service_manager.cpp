@@ -1,4 +1,4 @@
-// libsystemd's notifications and handed-over sockets. Any thread.
+// Notifications and socket activation with libsystemd.
 #include "platform/service_manager.h"
 
 #include <fmt/format.h>
@@ -37,8 +37,8 @@ void ServiceManager::stopping() {
 
 void ServiceManager::status(const std::string& text) {
   std::string assignment = "STATUS=" + text;
-  std::replace(assignment.begin(), assignment.end(), '\n',
-               ' ');  // a line break would begin another assignment
+  // A line break would begin another assignment.
+  std::replace(assignment.begin(), assignment.end(), '\n', ' ');
   ::sd_notify(0, assignment.c_str());
 }
 

@@ -1,4 +1,4 @@
-// The service manager, where there is one: readiness, status, watchdog, handed-over sockets. Any thread.
+// The service manager, if there is one: readiness, status, watchdog, socket activation.
 #pragma once
 
 #include <chrono>
@@ -18,12 +18,12 @@ struct HandedOver {
 
 class ServiceManager {
  public:
-  // Without NOTIFY_SOCKET in the environment every notification does nothing.
+  // Without NOTIFY_SOCKET in the environment, notifications do nothing.
   void ready();
   void stopping();
   void status(const std::string& text);
   void feedWatchdog();
-  // Half of WATCHDOG_USEC; absent when no watchdog is wanted of this process.
+  // Half of WATCHDOG_USEC; absent if this process has no watchdog.
   std::optional<std::chrono::milliseconds> watchdogInterval() const;
   // The listening Unix stream sockets that were handed over (socket activation), made close-on-exec. A second
   // one of the same name, or one of another kind, is an error that says what came.

@@ -1,12 +1,12 @@
-// Which errors of the system pass by themselves. A pure function; any thread.
+// Which errno values are shortages.
 #pragma once
 
 #include <cerrno>
 
 namespace veltrad::platform {
 
-// No descriptor, no memory, or a device that failed just now: an error of this one attempt, which nothing
-// remembers as an answer.
+// True if there was no descriptor or memory, or a device failed: an error of this attempt, which must not be
+// cached.
 constexpr bool isShortage(int error) {
   return error == EMFILE || error == ENFILE || error == ENOMEM || error == EAGAIN || error == EIO ||
          error == ENOBUFS;

@@ -1,4 +1,4 @@
-// The transaction as the service manager's STATUS text. Any thread.
+// Reports the transaction as the service manager's STATUS text.
 #include "platform/transaction.h"
 
 #include <cstdlib>

@@ -1,4 +1,4 @@
-// The platform transaction: open while the daemon serves, so that a stop drains first. Any thread.
+// The platform transaction, which is open while the daemon serves sessions.
 #pragma once
 
 #include <atomic>
@@ -10,12 +10,12 @@ class ServiceManager;
 class Transaction {
  public:
   virtual ~Transaction() = default;
-  // Strictly alternating; anything else is a broken invariant.
+  // Must alternate.
   virtual void open() = 0;
   virtual void close() = 0;
 };
 
-// Tells the service manager, as STATUS text, whether sessions are served.
+// Tells the service manager whether sessions are served. A second open() or close() aborts.
 class ServiceTransaction final : public Transaction {
  public:
   explicit ServiceTransaction(ServiceManager& manager) : _manager(manager) {}

@@ -1,4 +1,4 @@
-// UUIDs by RFC 4122, version 4, from the kernel's generator. Any thread.
+// UUIDs (RFC 4122, version 4) from the kernel's random bytes.
 #include "platform/uuid.h"
 
 #include <sys/random.h>
@@ -11,8 +11,8 @@ namespace veltrad::platform {
 
 std::array<unsigned char, 16> randomUUID() {
   std::array<unsigned char, 16> bytes{};
-  // So few bytes come whole, and once the kernel's generator is ready neither a signal nor a shortage stops
-  // them. OpenSSL's own generator would cost a start 8 million instructions, and can fail for want of memory.
+  // So few bytes are never cut by a signal, and this cannot fail once the kernel's generator is ready.
+  // OpenSSL's generator would take 8 million instructions at start, and can fail for lack of memory.
   if (getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) std::abort();
   bytes[6] = static_cast<unsigned char>((bytes[6] & 0x0f) | 0x40);
   bytes[8] = static_cast<unsigned char>((bytes[8] & 0x3f) | 0x80);

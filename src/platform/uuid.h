@@ -1,4 +1,4 @@
-// Random UUIDs, version 4. Any thread.
+// Random UUIDs, version 4.
 #pragma once
 
 #include <array>
@@ -7,7 +7,7 @@
 namespace veltrad::platform {
 
 std::array<unsigned char, 16> randomUUID();
-// 36 characters, upper-case hexadecimal: "6F9619FF-8B86-4011-B42D-00CF4FC964FF".
+// "6F9619FF-8B86-4011-B42D-00CF4FC964FF"
 std::string randomUUIDText();
 
 }  // namespace veltrad::platform

@@ -1,4 +1,4 @@
-// The fixed keys of the device property service. Any thread.
+// Reads device properties by their keys.
 #include "support/device_identity.h"
 
 #include <cstring>
@@ -6,25 +6,6 @@
 #include "platform/device_properties.h"
 
 namespace veltrad::support {
-
-std::optional<std::string> DeviceIdentity::deviceProductVersion() {
-  return value("ProductVersion");
-}
-std::optional<std::string> DeviceIdentity::deviceBuildVersion() {
-  return value("BuildVersion");
-}
-std::optional<std::string> DeviceIdentity::deviceProductType() {
-  return value("ProductType");
-}
-std::optional<std::string> DeviceIdentity::deviceName() {
-  return value("DeviceName");
-}
-std::optional<std::string> DeviceIdentity::deviceHardwareModel() {
-  return value("HWModelStr");
-}
-std::optional<std::string> DeviceIdentity::deviceSerialNumber() {
-  return value("SerialNumber");
-}
 
 void DeviceIdentity::copyUniqueDeviceID(char* buffer, std::size_t size) {
   const std::optional<std::string> id = value("UniqueDeviceID");

@@ -1,4 +1,4 @@
-// What the daemon says about the device that it runs on. Any thread.
+// Facts about the device that the daemon reports. Any thread may ask.
 #pragma once
 
 #include <cstddef>
@@ -14,39 +14,35 @@ class DeviceProperties;
 
 namespace veltrad::support {
 
-// Asks the device property service under fixed keys. Nothing is cached but whether the build is an internal
-// one. What the service cannot say for now is nothing, and is not remembered. The service must outlive it.
+// Reads properties of the device property service, which must outlive it. Only the release type is cached.
+// During a shortage, properties are absent.
 class DeviceIdentity {
  public:
   explicit DeviceIdentity(platform::DeviceProperties& properties) : _properties(properties) {}
 
-  // Each asks the service again; nothing where it has no value.
-  std::optional<std::string> deviceProductVersion();
-  std::optional<std::string> deviceBuildVersion();
-  std::optional<std::string> deviceProductType();
-  std::optional<std::string> deviceName();
-  std::optional<std::string> deviceHardwareModel();
-  std::optional<std::string> deviceSerialNumber();
+  std::optional<std::string> deviceProductVersion() { return value("ProductVersion"); }
+  std::optional<std::string> deviceBuildVersion() { return value("BuildVersion"); }
+  std::optional<std::string> deviceProductType() { return value("ProductType"); }
+  std::optional<std::string> deviceName() { return value("DeviceName"); }
+  std::optional<std::string> deviceHardwareModel() { return value("HWModelStr"); }
+  std::optional<std::string> deviceSerialNumber() { return value("SerialNumber"); }
 
-  // The unique id with its terminating NUL into `buffer` of `size` bytes (callers have 41). The buffer stays
-  // as it is when there is no id, or none that fits.
+  // Copies the unique ID and a NUL to `buffer`, which has `size` bytes. The buffer is unchanged if there is
+  // no ID or it does not fit.
   void copyUniqueDeviceID(char* buffer, std::size_t size);
 
-  // False only for another type than this, or none: what cannot be read just now may be it.
+  // True if this is the product type, or if it cannot be read because of a shortage.
   bool mayHaveProductType(std::string_view type);
 
-  // True when the release type is exactly "Internal". Decided when it can first be read, for the life of this
-  // object; until then false, or nothing.
+  // True if the release type is "Internal". Constant once it could be read; until then false, or absent.
   bool isInternalBuild() { return internalBuild().value_or(false); }
   std::optional<bool> internalBuild();
 
  private:
   std::optional<std::string> value(std::string_view key);
 
-  // Constant after construction.
   platform::DeviceProperties& _properties;
-
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};  // the first answer is kept
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<bool> _internalBuild GUARDED_BY(_mutex);
 };
 

@@ -1,4 +1,4 @@
-// Compression with zlib's deflate, one pass over the input.
+// Compresses with zlib's deflate in one pass over the input.
 #include "support/gzip.h"
 
 #include <zlib.h>
@@ -12,10 +12,12 @@ namespace veltrad::support {
 namespace {
 
 constexpr std::size_t kPieceBytes = 128u << 10;
-constexpr std::size_t kMostAtOnce = std::numeric_limits<int>::max();  // zlib counts its bounds in 32 bits
-constexpr const char* kZlibVersion = "1.2.8";  // the oldest whose streams are known to be read
+constexpr std::size_t kMostAtOnce = std::numeric_limits<int>::max();  // zlib's sizes have 32 bits
+// The oldest version of zlib that is accepted.
+constexpr const char* kZlibVersion = "1.2.8";
 constexpr int kMemoryLevel = 8;
-constexpr int kGzipWindowBits = 15 + 16;  // the largest window; a gzip header and trailer
+// The largest window, with a gzip header and trailer.
+constexpr int kGzipWindowBits = 15 + 16;
 
 struct FailureText {
   int result;
@@ -44,7 +46,9 @@ const char* shown(const char* message) {
   return message != nullptr ? message : "(null)";
 }
 
-// One stream of deflate; ends with its object.
+}  // namespace
+
+// A deflate stream.
 class Deflation {
  public:
   Deflation() = default;
@@ -64,11 +68,13 @@ class Deflation {
     }
     return _begun;
   }
+  // Makes a used stream as good as new.
+  bool beginAnew() { return deflateReset(&stream) == Z_OK; }
   void give(const char* bytes, std::size_t count) {
     stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes));  // zlib only reads them
     stream.avail_in = static_cast<uInt>(count);
   }
-  // deflate()'s result, with `room` to write to.
+  // Writes to `room` and returns the result of deflate().
   int run(int flush, std::string& room) {
     stream.next_out = reinterpret_cast<Bytef*>(room.data());
     stream.avail_out = static_cast<uInt>(room.size());
@@ -85,6 +91,8 @@ class Deflation {
   bool _begun = false;
 };
 
+namespace {
+
 void sayEmpty() {
   logError("compressDataWithZlibOrGzip: Cannot compress empty Torvane");
 }
@@ -98,7 +106,7 @@ void sayCompressed(std::size_t from, std::size_t to) {
            static_cast<unsigned>(to));
 }
 
-// Hands on what comes out, all of it where `flush` says so.
+// Passes the output to `sink`.
 bool append(Deflation& deflation, int flush, std::string& room, const ByteSink& sink) {
   int result = Z_OK;
   do {
@@ -133,27 +141,45 @@ bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
   return true;
 }
 
-std::optional<std::string> deflateAtOnce(std::string_view bytes) {
-  Deflation deflation;
-  if (!deflation.begin()) return std::nullopt;
+}  // namespace
+
+GzipCompressor::GzipCompressor() = default;
+GzipCompressor::~GzipCompressor() = default;
+
+void GzipCompressor::rest() {
+  std::unique_ptr<Deflation> kept;
+  const Lock held(_mutex);
+  kept.swap(_kept);
+}
+
+std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes) {
+  std::unique_ptr<Deflation> taken;
+  {
+    const Lock held(_mutex);
+    taken.swap(_kept);
+  }
+  if (!taken || !taken->beginAnew()) {
+    taken = std::make_unique<Deflation>();
+    if (!taken->begin()) return std::nullopt;
+  }
+  Deflation& deflation = *taken;
   deflation.give(bytes.data(), bytes.size());
   std::string output(deflateBound(&deflation.stream, bytes.size()), '\0');
   int result = deflation.run(Z_FINISH, output);
-  if (result == Z_OK)
-    result = deflate(&deflation.stream, Z_FINISH);  // without room, which is then the failure
+  if (result == Z_OK) result = deflate(&deflation.stream, Z_FINISH);  // fails, since no room is left
   if (result != Z_STREAM_END) {
     deflation.sayFailure(result);
     return std::nullopt;
   }
   output.resize(deflation.stream.total_out);
-  output.shrink_to_fit();  // it may wait long for a server, and bounds count its size
+  output.shrink_to_fit();  // it may wait for a server for a long time
   sayCompressed(bytes.size(), output.size());
+  const Lock held(_mutex);
+  _kept.swap(taken);
   return output;
 }
 
-}  // namespace
-
-std::optional<std::string> gzipDeflate(std::string_view bytes) {
+std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes) {
   if (bytes.empty()) {
     sayEmpty();
     return std::nullopt;

@@ -1,26 +1,46 @@
-// Compression to a gzip stream (RFC 1952), by the caller's thread alone. What goes wrong is one error line,
-// here and nowhere else.
+// Compression to a gzip stream (RFC 1952) on the caller's thread. Failures are logged here.
 #pragma once
 
 #include <cstddef>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "base/mutex.h"
+
 namespace veltrad::support {
 
-// Nothing: there are no bytes, memory is short or zlib fails.
-std::optional<std::string> gzipDeflate(std::string_view bytes);
+class Deflation;
 
-// Fills `place` with the next bytes, at most `room`, and says how many; 0 at the end. Nothing: no more can be
-// had, and a line has said why.
+// Compresses texts. Keeps one stream of zlib (some 270 KB) between them, because memory that is taken from
+// the system and returned for each text costs dozens of page faults. Any thread.
+class GzipCompressor {
+ public:
+  GzipCompressor();
+  ~GzipCompressor();
+
+  // Absent if there are no bytes, memory is short or zlib fails.
+  std::optional<std::string> gzipDeflate(std::string_view bytes);
+  // Frees the stream until the next text.
+  void rest();
+
+ private:
+  std::optional<std::string> deflateAtOnce(std::string_view bytes);
+
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::unique_ptr<Deflation> _kept GUARDED_BY(_mutex);
+};
+
+// Writes the next bytes to `place`, at most `room`, and returns how many; 0 at the end. Absent after a
+// failure, which it logs.
 using ByteSource = std::function<std::optional<std::size_t>(char* place, std::size_t room)>;
-// Takes the next bytes of an output. False: it can take no more, and a line has said why.
+// Takes the next bytes. False after a failure, which it logs.
 using ByteSink = std::function<bool(std::string_view bytes)>;
 
-// The stream of what `source` gives, handed on to `sink` as it is made: only pieces are in memory. False
-// where it fails, too.
+// Compresses what `source` returns piece by piece, and passes the output to `sink`. False if any of them
+// fails.
 bool gzipDeflate(const ByteSource& source, const ByteSink& sink);
 
 }  // namespace veltrad::support

@@ -1,4 +1,4 @@
-// The diagnostic message log: one current file, retired after a day.
+// The diagnostic message log: chooses, writes and removes its files.
 #include "support/message_log.h"
 
 #include <dirent.h>
@@ -25,7 +25,7 @@ namespace veltrad::support {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
-constexpr std::size_t kLineBytes = 128;  // what a line that waits keeps beside its text
+constexpr std::size_t kLineBytes = 128;  // the memory of a waiting line besides its text
 constexpr std::string_view kPrefix = "veltrad_";
 constexpr std::string_view kSuffix = "_messageLog.diag";
 
@@ -33,7 +33,7 @@ double secondsOf(const struct statx_timestamp& time) {
   return static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9;
 }
 
-// The part between the underscores of a name that is one of the daemon's log files.
+// The part between the underscores of a log file's name; absent for any other name.
 std::optional<std::string_view> secondsInLogFileName(std::string_view name) {
   if (!name.starts_with(kPrefix) || !name.ends_with(kSuffix) ||
       name.size() < kPrefix.size() + kSuffix.size()) {
@@ -45,8 +45,8 @@ std::optional<std::string_view> secondsInLogFileName(std::string_view name) {
   return name;
 }
 
-// Of the birth time and the modification time the earlier, in seconds since 1970; without a birth time the
-// seconds in the file's own name. Links are not followed.
+// The earlier of birth and modification time, or without a birth time the seconds in the file's name. In
+// seconds since 1970. Links are not followed.
 std::optional<double> creationDate(const std::string& path) {
   struct statx facts {};
   if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BTIME | STATX_MTIME, &facts) != 0)
@@ -113,7 +113,7 @@ bool MessageLog::append(const std::string& line) {
   auto file = newestSurvivor();
   if (!file) file = createFile();
   if (!file) return false;
-  // Follows no link and waits for nothing.
+  // Neither follows a link nor blocks.
   const FileDescriptor opened(
       open(file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
   if (write(opened.get(), line.data(), line.size()) != static_cast<ssize_t>(line.size())) {
@@ -128,7 +128,7 @@ std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
   const FileDescriptor directory(open(_directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!directory.isOpen() && errno == ENOENT) {
     logInfo("writeToLogFile: Creating veltrad log directory at %s", _directory.c_str());
-    static_cast<void>(platform::makeDirectories(_directory));  // where it fails, so does making the file
+    static_cast<void>(platform::makeDirectories(_directory));  // if it fails, making the file fails
     return std::nullopt;
   }
   if (!directory.isOpen()) {
@@ -181,7 +181,7 @@ std::optional<MessageLog::LogFile> MessageLog::createFile() {
 }
 
 void MessageLog::remove(const LogFile& file) {
-  ::remove(file.path.c_str());  // an empty directory of such a name, too
+  ::remove(file.path.c_str());  // also removes an empty directory
   logInfo("writeToLogFile: Deleted expired veltrad log file %s (%s)", file.path.c_str(),
           createdText(file.created).c_str());
 }

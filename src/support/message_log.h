@@ -1,4 +1,4 @@
-// The diagnostic message log: a readable record of what the backends sent, one current file. Any thread.
+// The diagnostic message log: a readable record of what the back ends sent. Any thread may write.
 #pragma once
 
 #include <cstddef>
@@ -16,7 +16,7 @@ class Counters;
 
 namespace veltrad::support {
 
-// A text in which each "%@" stands for a value; one whose number differs from `count` does not compile.
+// A format in which "%@" stands for a value. It compiles only if there are `count` of them.
 template <std::size_t count>
 struct MessageFormat {
   consteval MessageFormat(const char* format) : text(format) {
@@ -27,17 +27,17 @@ struct MessageFormat {
   std::string_view text;
 };
 
-// In a directory of its own, files "veltrad_SECONDS_messageLog.diag", one of them current and at most a day
-// old. The directory is the only state. Nobody waits for the disk: lines are stamped and queued, and the disk
-// writer's thread does the rest; a line that is not written is counted.
+// Writes to the newest file "veltrad_SECONDS_messageLog.diag" in its directory and removes the others; a file
+// is used for at most a day. Keeps no state besides the directory. Lines are time-stamped and queued, and the
+// disk writer's thread writes them; lines that are not written are counted.
 class MessageLog {
  public:
-  static constexpr std::size_t kMostBytes = 4u << 20;  // of lines that wait; a single one may be longer
+  // Limit for the lines that wait; a single one may be longer.
+  static constexpr std::size_t kMostBytes = 4u << 20;
 
-  // What it takes outlives it. The directory is made by the first message.
+  // What it takes must outlive it. The directory is made by the first message.
   MessageLog(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer,
              platform::Counters& counters);
-  // Appends one time-stamped line.
   template <typename... Values>
   void writeToLogFile(MessageFormat<sizeof...(Values)> format, const Values&... values) {
     put(format.text, {std::string_view(values)...});
@@ -46,7 +46,8 @@ class MessageLog {
  private:
   struct LogFile {
     std::string path;
-    std::optional<double> created;  // seconds since 1970
+    // Seconds since 1970.
+    std::optional<double> created;
   };
   void put(std::string_view format, std::initializer_list<std::string_view> values);
   bool append(const std::string& line);
@@ -59,7 +60,8 @@ class MessageLog {
   const std::string _directory;
   platform::Counters& _counters;
 
-  platform::DiskWriter::Queue _queue;  // last: its end is the end of the writer's work here
+  // Last, because its destructor ends the writer's use of the others.
+  platform::DiskWriter::Queue _queue;
 };
 
 // "2014-11-16 20:13:54 +0000"

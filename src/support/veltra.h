@@ -1,5 +1,4 @@
-// Facts of the client library that the daemon shares: its package version, its public key, its identifiers.
-// Any thread.
+// Facts about the client library that the daemon uses: its package version, public key and identifiers.
 #pragma once
 
 #include <optional>
@@ -23,16 +22,16 @@ class Veltra {
  public:
   Veltra(platform::FileStore& files, platform::Preferences& preferences, const platform::Root& root);
 
-  // String "version" of usr/share/veltra/package.plist; "8.0" when the package states none.
+  // The text "version" in usr/share/veltra/package.plist, else the daemon's version.
   std::string packageVersion() const;
-  // The same; a failure is a shortage: for now nobody can say.
+  // The same, but fails during a shortage.
   Result<std::string, platform::FileFailure> statedVersion() const;
-  // The bytes of the resource "publicKey" of type "der"; read afresh at each call.
+  // The bytes of the resource "publicKey" of type "der", read at each call.
   Result<std::string, platform::FileFailure> publicKeyDER() const;
   const std::string& publicKeyPath() const { return _publicKeyPath; }
-  // A 36-character UUID text that stays the same across restarts: one while consent is respected (true),
-  // another while it is overridden (false). Made and stored on first use under "uuidRespectDNU" and
-  // "uuidOverrideDNU". Nothing: for a shortage nobody can say which it is.
+  // A UUID that persists across restarts: one for when consent is respected, another for when it is
+  // overridden. Made and stored at the first use, under "uuidRespectDNU" and "uuidOverrideDNU". Absent during
+  // a shortage.
   std::optional<std::string> getPersistentIdentifierForDNU(bool respectDNU) const;
 
  private:

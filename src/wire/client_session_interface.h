@@ -1,5 +1,5 @@
-// What the daemon exports to each connection. The connection's own thread calls it, one call at a time, in
-// order.
+// The interface of a session that the daemon exports to each connection. The connection's own thread makes
+// the calls, one at a time and in order.
 #pragma once
 
 #include <cstdint>
@@ -13,8 +13,8 @@
 
 namespace veltrad::wire {
 
-// Called at most once, from any thread. When the last copy goes without a call, the client's call ends with
-// the error "The daemon gave no reply.". Empty where the client wants no reply.
+// Called at most once, from any thread. If all copies are destroyed without a call, the client's call ends
+// with the error "The daemon gave no reply.". Empty if the client wants no reply.
 template <typename... Results>
 using Reply = std::function<void(Results...)>;
 
@@ -30,7 +30,7 @@ class ClientSessionInterface {
  public:
   virtual ~ClientSessionInterface() = default;
 
-  // False: the daemon may not keep so much for the client's user; nothing has changed.
+  // False if the client's user would exceed its share of memory; then nothing has changed.
   virtual bool setSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                               std::optional<Array> frameworksToCheck, bool hasAggregationBlock) = 0;
   virtual void startConfigWithCompletionHandler(NamesReply completionHandler) = 0;
@@ -41,8 +41,7 @@ class ClientSessionInterface {
   virtual void sendMessageWithDictionary(Dictionary message, StringReply reply) = 0;
   virtual void flushMessagesWithCompletion(FlushReply completion) = 0;
   virtual void finishSessionWithReply(StringReply reply) = 0;
-  // `path` is the path of the client's file address. `extensionToken` names what the client lent; empty:
-  // nothing.
+  // `extensionToken` names the file that the client lent; empty if it lent none.
   virtual void uploadFileAtPath(std::string path, std::string extensionToken,
                                 BooleanReply completionHandler) = 0;
   virtual void uploadLogData(Array logData, UploadLogDataReply completionHandler) = 0;
@@ -50,10 +49,9 @@ class ClientSessionInterface {
                                           std::uint16_t category, std::uint16_t type,
                                           OptionalDictionary payload, StringReply reply) = 0;
 
-  // After the connection was invalidated and its handler has run, on the connection's own thread; once, the
-  // last call of all.
+  // The last call, made once, after the connection's invalidation handler has run.
   virtual void end() = 0;
-  // For log lines; stable and unique among live objects.
+  // For log lines; constant, and unique among live objects.
   virtual std::string description() const = 0;
 };
 

@@ -1,10 +1,9 @@
-// The names that daemon, library and storebags share. Constants; any thread.
+// The names that the daemon, the library and storebags share.
 #pragma once
 
 namespace veltrad::wire {
 
-// The service and the entitlement that a client must hold (a boolean true).
-inline constexpr const char* kVeltraServiceName = "com.florn.veltrad";
+// A client must hold this entitlement with the value true.
 inline constexpr const char* kVeltraEntitlement = "com.florn.private.veltrad";
 
 // What a peer of the control socket must hold; root and the daemon's own user need neither. "control"
@@ -22,22 +21,22 @@ inline constexpr const char* kVeltraBackendMivo = "mivo";
 
 inline constexpr const char* kVeltraErrorDomain = "com.florn.veltra.error";
 
-// Session info dictionary.
-inline constexpr const char* kVeltraSessionInfoSessionID = "sessionID";              // unsigned 32-bit
-inline constexpr const char* kVeltraSessionInfoClientType = "clientType";            // signed 32-bit
-inline constexpr const char* kVeltraSessionInfoClientVersion = "clientVersion";      // unsigned 16-bit
-inline constexpr const char* kVeltraSessionInfoRequireUserInfo = "requireUserInfo";  // boolean
-inline constexpr const char* kVeltraSessionInfoBatchEvent = "batchEvent";            // boolean
+// Keys of the session info: unsigned 32-bit, signed 32-bit, unsigned 16-bit, boolean, boolean.
+inline constexpr const char* kVeltraSessionInfoSessionID = "sessionID";
+inline constexpr const char* kVeltraSessionInfoClientType = "clientType";
+inline constexpr const char* kVeltraSessionInfoClientVersion = "clientVersion";
+inline constexpr const char* kVeltraSessionInfoRequireUserInfo = "requireUserInfo";
+inline constexpr const char* kVeltraSessionInfoBatchEvent = "batchEvent";
 
-// User info dictionary.
-inline constexpr const char* kVeltraUserInfoClientName = "clientName";    // text
-inline constexpr const char* kVeltraUserInfoServiceName = "serviceName";  // text
+// Keys of the user info that the daemon reads: texts.
+inline constexpr const char* kVeltraUserInfoClientName = "clientName";
+inline constexpr const char* kVeltraUserInfoServiceName = "serviceName";
 
-// Message dictionary.
-inline constexpr const char* kVeltraMessageParametersCategory =
-    "category";                                                      // unsigned 32-bit, low 16 bits used
-inline constexpr const char* kVeltraMessageParametersType = "type";  // unsigned 32-bit, low 16 bits used
-inline constexpr const char* kVeltraMessageParametersPayload = "payload";  // dictionary
-inline constexpr const char* kVeltraMessageParametersFlag = "flag";        // unsigned 32-bit
+// Keys of a message: unsigned 32-bit numbers, of which category and type use the low 16 bits, and a
+// dictionary.
+inline constexpr const char* kVeltraMessageParametersCategory = "category";
+inline constexpr const char* kVeltraMessageParametersType = "type";
+inline constexpr const char* kVeltraMessageParametersFlag = "flag";
+inline constexpr const char* kVeltraMessageParametersPayload = "payload";
 
 }  // namespace veltrad::wire

@@ -1,4 +1,4 @@
-// Error objects made and put on the wire. Any thread.
+// Error objects and their dictionaries on the wire.
 #include "wire/error.h"
 
 #include "wire/constants.h"
@@ -6,11 +6,9 @@
 namespace veltrad::wire {
 
 namespace {
-
 constexpr const char* kDomain = "domain";
 constexpr const char* kCode = "code";
 constexpr const char* kDescription = "description";
-
 }  // namespace
 
 ReportingError makeReportingError(std::string description, std::int64_t code) {

@@ -1,4 +1,4 @@
-// The error object that answers carry. A plain value; any thread.
+// The error object of replies.
 #pragma once
 
 #include <cstdint>
@@ -9,21 +9,22 @@
 namespace veltrad::wire {
 
 struct ReportingError {
-  std::string domain;       // kVeltraErrorDomain
-  std::int64_t code = -1;   // -1 for local failures, else the HTTP status of a server's refusal
-  std::string description;  // the message text
+  std::string domain;
+  // -1 for local failures, else the HTTP status with which a server refused.
+  std::int64_t code = -1;
+  std::string description;
   bool operator==(const ReportingError&) const = default;
 };
 
-// Domain kVeltraErrorDomain.
+// In the domain kVeltraErrorDomain.
 ReportingError makeReportingError(std::string description, std::int64_t code);
 
-// On the wire: {"domain", "code", "description"}.
+// {"domain", "code", "description"}
 Dictionary dictionaryOfError(const ReportingError& error);
-// What is missing or of another type is empty.
+// What is missing or of another type is empty; the code is then -1.
 ReportingError errorOfDictionary(const Dictionary& dictionary);
 
-// Of a call whose callback the daemon let go without calling it.
+// The error of a call whose callback the daemon destroyed without calling it.
 inline constexpr const char* kNoReplyDescription = "The daemon gave no reply.";
 
 }  // namespace veltrad::wire

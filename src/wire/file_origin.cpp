@@ -1,4 +1,4 @@
-// /proc and calls that stay in the kernel: fstat, fstatfs and read would ask the file's server, and wait.
+// Uses /proc and calls that never leave the kernel: fstat, fstatfs and read could wait for a file server.
 #include "wire/file_origin.h"
 
 #include <fcntl.h>
@@ -21,7 +21,7 @@ constexpr std::array<std::string_view, 28> kLocal{
     "reiserfs", "rootfs",    "squashfs", "sysfs", "tmpfs", "udf",   "vfat",   "xfs"};
 constexpr std::size_t kMostMountInfo = 8u << 20;
 
-// Empty where it cannot be read.
+// Empty if it cannot be read.
 std::string contentOf(const std::string& path) {
   const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   std::string text;
@@ -63,7 +63,7 @@ std::optional<std::string> typeOfMount(std::string_view mountInfo, std::string_v
 }
 
 FileOrigin FileOrigin::of(int descriptor, pid_t lender) {
-  // Memory files are of a mount that no list has; nothing but memory has seals.
+  // The mount of memory files is in no list. Only they have seals.
   if (::fcntl(descriptor, F_GET_SEALS) >= 0) return {Kind::local, "tmpfs"};
   const std::string facts = contentOf(fmt::format("/proc/self/fdinfo/{}", descriptor));
   const std::string_view mount = wordAfter(facts, "mnt_id:");
@@ -71,7 +71,7 @@ FileOrigin FileOrigin::of(int descriptor, pid_t lender) {
     return {kindOfFileSystem(*type), *type};
   }
   if (lender <= 0) return {};
-  // Numbers of mounts are unique in the kernel, so whoever has that process number now is no danger.
+  // Mount numbers are unique in the kernel, so it does no harm if another process has this number by now.
   const auto type = typeOfMount(contentOf(fmt::format("/proc/{}/mountinfo", lender)), mount);
   if (!type) return {};
   const Kind kind = kindOfFileSystem(*type);

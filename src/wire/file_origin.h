@@ -1,4 +1,4 @@
-// Where an open file's bytes come from, found out without asking whoever serves them. Any thread.
+// What kind of file system an open file belongs to, determined without contacting a file server.
 #pragma once
 
 #include <sys/types.h>
@@ -10,26 +10,24 @@
 namespace veltrad::wire {
 
 struct FileOrigin {
-  enum class Kind {
-    local,    // the kernel's own: memory, or a device that it reads itself
-    stacked,  // shows the files of others, whatever those are: overlay
-    foreign,  // a program or another machine answers, or does not; or nobody can tell
-  };
+  // local: the kernel serves it from memory or a device. stacked: it shows the files of other file systems
+  // (overlay). foreign: a program or another machine serves it, or this is unknown.
+  enum class Kind { local, stacked, foreign };
   Kind kind = Kind::foreign;
-  std::string fileSystem = "unknown";  // as /proc/self/mountinfo names it: "ext4", "fuse.sshfs"
+  // As in /proc/self/mountinfo: "ext4", "fuse.sshfs".
+  std::string fileSystem = "unknown";
 
-  // Whether a read of it ends by the kernel's word alone. `lender`: who opened it, perhaps in a mount
-  // namespace of its own; what is stacked there may be stacked on anything.
+  // `lender` is the process that opened the file. A stacked file system of its own mount namespace counts as
+  // foreign, since what lies below is unknown.
   static FileOrigin of(int descriptor, pid_t lender);
 };
 
-// The verdict on a type's name.
+// The kind of a file system, by the name of its type.
 FileOrigin::Kind kindOfFileSystem(std::string_view type);
 // The type of the mount with this number in a text like /proc/self/mountinfo (proc_pid_mountinfo(5)).
 std::optional<std::string> typeOfMount(std::string_view mountInfo, std::string_view number);
 
-// Certainly none: a socket, a pipe, a directory, a device or the like. What cannot be told without asking the
-// file's server is not.
+// True for a socket, a pipe, a directory, a device and the like. False if only a file server could tell.
 bool isNoRegularFile(int descriptor);
 
 }  // namespace veltrad::wire

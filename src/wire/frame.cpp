@@ -1,4 +1,4 @@
-// Frames to bytes and back. Any thread, one at a time.
+// Encodes and decodes frames.
 #include "wire/frame.h"
 
 #include <algorithm>
@@ -66,7 +66,7 @@ std::pair<char*, std::size_t> FrameReader::room(std::size_t least) {
   return {_buffer.get() + _filled, _capacity - _filled};
 }
 
-// To so many bytes, of which what was handed out needs none. While it grows both buffers are there.
+// Drops what was handed out. While the buffer grows, both the old and the new one are charged.
 bool FrameReader::resizeBuffer(std::size_t bytes) {
   if (_memory && bytes > _capacity && !_memory->bufferOf(_capacity + bytes)) return false;
   std::unique_ptr<char[]> fresh(bytes > 0 ? new (std::nothrow) char[bytes] : nullptr);
@@ -82,13 +82,9 @@ bool FrameReader::resizeBuffer(std::size_t bytes) {
 }
 
 void FrameReader::rest() {
-  // A frame that still grows keeps the room that it has grown by.
+  // The buffer of an unfinished frame keeps its spare room.
   const std::size_t wanted = std::max(_filled - _taken, kIdleReadBytes);
   if (_capacity > wanted + wanted / 2 + kIdleReadBytes) resizeBuffer(wanted);
-}
-
-void FrameReader::received(std::size_t count) {
-  _filled += count;
 }
 
 FrameReader::Next FrameReader::next(Frame& frame) {
@@ -126,10 +122,6 @@ FrameReader::Next FrameReader::skip(Frame& frame) {
   _toSkip.reset();
   frame = {_skipped, {}, true};
   return Next::frame;
-}
-
-bool FrameReader::inFrame() const {
-  return _toSkip || _filled - _taken >= kFrameHeaderBytes;
 }
 
 }  // namespace veltrad::wire

@@ -1,22 +1,23 @@
-// What a frame may hold, the same for both ends of the socket. Constants; any thread.
+// The limits of frames, the same for both ends of the socket.
 #pragma once
 
 #include "base/property_list.h"
 
 namespace veltrad::wire {
 
-inline constexpr std::size_t kFrameBodyLimit = 1u << 20;        // 1,048,576 bytes
-inline constexpr std::size_t kLargeFrameBodyLimit = 16u << 20;  // of log data alone
+// Bytes of a frame's body, and of a large call's, which carries log data.
+inline constexpr std::size_t kFrameBodyLimit = 1u << 20;
+inline constexpr std::size_t kLargeFrameBodyLimit = 16u << 20;
 
-// Of a frame's body: keys, values and containers, each where it stands (objectsIn()), and nesting.
+// Objects in a call's body, as objectsIn() counts them, and nesting.
 inline constexpr std::size_t kMostCallObjects = 100'000;
 inline constexpr int kMostFrameDepth = 64;
-// The daemon adds to a client's payload: what it writes may have so many objects.
+// Objects in the daemon's frames: it adds some to a client's payload.
 inline constexpr std::size_t kMostDaemonObjects = kMostCallObjects + 1'000;
-// The values of one call, in memory.
+// Memory for the values of one call.
 inline constexpr std::size_t kMostCallMemory = 8u << 20;
 
-// What the library reads of the daemon's frames: whatever the daemon may write.
+// The library's limits when it reads a frame: whatever the daemon may write.
 inline constexpr PropertyListLimits kDaemonFrameLimits{kFrameBodyLimit, kMostFrameDepth, kMostDaemonObjects,
                                                        2 * kMostCallMemory};
 

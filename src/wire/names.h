@@ -1,9 +1,9 @@
-// The words of frames (docs/wire-protocol.md): operations, events and keys, the same for both ends.
+// The names in frames (docs/wire-protocol.md): operations, events and keys.
 #pragma once
 
 namespace veltrad::wire {
 
-// What a client calls.
+// The calls of a client.
 namespace operation {
 inline constexpr const char* kFetchDisplayURL = "fetchDisplayURL:";
 inline constexpr const char* kFetchStates = "fetchStatesWithUserInfo:completionHandler:";
@@ -49,11 +49,11 @@ inline constexpr const char* kWire = "wire";
 inline constexpr const char* kArguments = "args";
 inline constexpr const char* kOperation = "op";
 
-// Of a reply; the error in a refusal and in the results, too.
+// Of a reply. The error also occurs in a refusal and in results.
 inline constexpr const char* kError = "error";
 inline constexpr const char* kResults = "results";
 
-// Arguments. A call with a category, a type and a payload of its own names them like a message dictionary.
+// Arguments.
 inline constexpr const char* kCall = "call";
 inline constexpr const char* kCategory = "category";
 inline constexpr const char* kData = "data";

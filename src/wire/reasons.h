@@ -1,4 +1,5 @@
-// Why a message, or what carries it, fared as it did: one table for counters, tools and both ends.
+// The reasons that are counted for messages and for what carries them: one table for the daemon and its
+// tools.
 #pragma once
 
 #include <cstddef>
@@ -8,7 +9,7 @@
 
 namespace veltrad::wire {
 
-// Spelt as their machine names, which other programs rely on: a search for one finds all its places.
+// Spelt as the names that other programs rely on, so that a search finds all uses.
 enum class Reason : std::uint8_t {
 #define VELTRA_REASON(concern, name, text) name,
 #include "wire/reasons.def"
@@ -16,9 +17,12 @@ enum class Reason : std::uint8_t {
 };
 
 struct ReasonEntry {
-  std::string_view concern;  // what is counted: "message", "log data"
-  std::string_view name;     // [a-z][a-z0-9_]*, for programs
-  std::string_view text;     // what happened, then why; the key in run/veltrad/counters.json
+  // What is counted: "message", "log data".
+  std::string_view concern;
+  // [a-z][a-z0-9_]*, for programs.
+  std::string_view name;
+  // What happened, then why; the key in run/veltrad/counters.json.
+  std::string_view text;
 };
 
 inline constexpr ReasonEntry kReasons[] = {

@@ -1,4 +1,4 @@
-// Where the daemon listens.
+// Paths under the root directory.
 #include "wire/socket_path.h"
 
 #include <cstdlib>

@@ -1,4 +1,4 @@
-// Where the daemon listens: a path under the system's root directory, known to both ends of the socket.
+// The path of the daemon's socket under the root directory, for both ends of the socket.
 #pragma once
 
 #include <string>
@@ -6,7 +6,7 @@
 
 namespace veltrad::wire {
 
-// VELTRA_ROOT, or "/" where it is unset or empty.
+// VELTRA_ROOT, or "/" if it is unset or empty.
 std::string rootFromEnvironment();
 // `relative` without a leading slash: pathUnder("/", "etc/veltrad/ca.pem").
 std::string pathUnder(std::string root, std::string_view relative);

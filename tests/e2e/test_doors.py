@@ -33,10 +33,6 @@ class Doors(SystemTest):
             self.assertIn(ENTITLEMENT, said)
             self.assertIn("entitlements.plist", said)
             self.root.grant([{"gid": os.getgid(), "entitlements": {ENTITLEMENT: True}}])  # takes effect at once
-            self.assertEqual(self.open()[1], ["httppost"])
-
-    def test_lines_of_a_connection(self):
-        with self.serving() as daemon:
             client = Wire(self.root)
             client.send(Wire.CALL, b"no property list", call=7)
             client.frame()

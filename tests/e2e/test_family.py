@@ -3,11 +3,12 @@ import concurrent.futures
 import re
 import time
 
-from harness import storebag, wait_until
+from harness import Wire, storebag, wait_until
 from test_https import Client, HTTPSTest, entry
 
 ROOT, CHILD, GRANDCHILD = 7, 6, 8  # client types whose storebags give the levels 0, 1 and 2
 BAGS = {ROOT: "quindle", CHILD: "ostvane", GRANDCHILD: "brevatto"}
+UPLOAD = "uploadFileAtPath:extensionToken:completionHandler:"
 DESCRIBE = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
 PROXY = "<3>sendMessageWithDictionary: Failed to get remote object proxy: "
 END = {"timestamp": 0.0, "category": 0, "type": 0}
@@ -120,25 +121,17 @@ class Family(HTTPSTest):
             daemon.wait_for_line(f"syncReportingStates: child session {child.number} (backend httppost) with hierarchy 1 is "
                                  "missing its parent")
 
-    # Entries of parent and child, status of the parent's collector, whether the child reports.
-    OUT, HELD = {"sampling_threshold": 0, "override_sampling": 0}, {"sampling_threshold": 0}
-    STATES = [({}, {}, 200, True), (OUT, {}, 200, False), (HELD, {}, 200, True), ({}, OUT, 200, True),
-              (OUT, HELD, 200, True), ({}, {}, 503, False)]
-
     def test_states_come_from_the_parent(self):
-        def entries(level, which):
-            return [entry(f"case{number}", hierarchy=level, **case[which]) for number, case in enumerate(self.STATES)]
-        self.bag(ROOT, *entries(0, 0))
-        self.bag(CHILD, *entries(1, 1), httppost2={"clients": [entry(client=None, hierarchy=1)]})  # not the parent's
+        """Of a back end of the same name; every combination is in tests/daemon/families_test.cpp."""
+        out = {"sampling_threshold": 0, "override_sampling": 0}
+        self.bag(ROOT, *(entry(name, hierarchy=0, **more) for name, more in (("in", {}), ("out", out), ("broken", {}))))
+        self.bag(CHILD, *(entry(name, hierarchy=1, **more) for name, more in (("in", out), ("out", {}), ("broken", {}))),
+                 httppost2={"clients": [entry(client=None, hierarchy=1)]})
+        self.lab.control(path="/events/broken", status=503)
         with self.serving() as daemon:
-            for number, (*_, status, reports) in enumerate(self.STATES):
-                with self.subTest(number):
-                    self.lab.control(path=f"/events/case{number}", status=status)
-                    root = self.join(ROOT, name=f"case{number}", batch=True)
-                    if status == 503:
-                        self.assertEqual(root.flush()[1], 503)
-                    child = self.join(CHILD, name=f"case{number}")
-                    self.assertEqual(child.backends, ["httppost"] * reports)
+            for name, code, backends in (("in", None, ["httppost"]), ("out", -1, []), ("broken", 503, [])):
+                self.assertEqual(self.join(ROOT, name=name, batch=True).flush()[1], code)
+                self.assertEqual(self.join(CHILD, name=name).backends, backends)
             daemon.wait_for_line("<7>HTTPSPostBackend(syncReportingStates): httppost: state and sampling rate updated to 1")
 
     def test_a_client_that_does_not_read_delays_nobody(self):
@@ -169,3 +162,19 @@ class Family(HTTPSTest):
         # The lines account for every lost copy, including the last two at the end of the session.
         said = [int(re.search(r"(?:\((\d+) copies since the last such line\))?$", line)[1] or 1) for line in lines]
         self.assertEqual(sum(said), sent - len(numbers) + counts["event dropped: the client has gone"])
+
+    def test_the_removal_of_an_uploaded_file_finds_room_where_copies_do_not(self):
+        self.bag(ROOT, entry(hierarchy=0), uploadserver={"post_url": "${url}/upload"})
+        self.lab.control(path="/upload", stall=True)
+        with self.serving(PROXY), open(self.root.path / "file", "w+b") as file:
+            file.write(b"lent")
+            file.flush()
+            root, child = self.join(ROOT, aggregates=True), self.join(CHILD)
+            root.send(Wire.CALL, {"op": UPLOAD, "args": {"path": "/lent"}}, 777, 1, [file.fileno()])
+            self.lab.received("uploads", 1)
+            for length in (*[1000] * 1300, *range(1000, -1, -1)):  # until none of any size is taken
+                child.message(text="x" * length)
+            self.lab.reset()
+            self.assertEqual(root.frame()[1:], (777, {"results": {"uploaded": True}}))
+            self.assertIn({"call": 777}, root.copies)
+        self.assertGreater(self.counts()["event dropped: the client does not read"], 1000)

@@ -10,6 +10,7 @@
 #include <string>
 #include <string_view>
 
+#include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "platform/clock.h"
 #include "platform/device_properties.h"
@@ -79,12 +80,17 @@ class FakePreferences {
   operator platform::Preferences&() { return _preferences; }
   // In the domain kVeltraPreferenceDomain.
   void set(std::string_view key, const Value& value) {
-    _preferences.setValue(platform::kVeltraPreferenceDomain, key, value);
+    const auto bytes = _files.read(kPath, 1u << 20);
+    const auto list = parseBinaryPropertyList(bytes ? bytes.value() : "");
+    Dictionary all = list ? *list.value().asDictionary() : Dictionary();
+    all.set(std::string(key), value);
+    _files.put(kPath, writeBinaryPropertyList(all));
   }
-  void clear() { _files.remove("/preferences/com.florn.veltra.plist"); }
+  void clear() { _files.remove(kPath); }
   void runShort(bool isShort) { _files.runShort(isShort); }
 
  private:
+  static constexpr const char* kPath = "/preferences/com.florn.veltra.plist";
   FakeFileStore _files;
   platform::FilePreferences _preferences{_files, "/preferences"};
 };

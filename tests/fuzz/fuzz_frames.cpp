@@ -9,60 +9,13 @@
 #include <tuple>
 #include <vector>
 
+#include "fakes/answering_session.h"
 #include "ipc/dispatcher.h"
 #include "wire/frame.h"
 
 namespace {
 
 using namespace veltrad;
-
-// Counts the calls, and answers them in its own ways or not at all.
-class AnsweringSession final : public wire::ClientSessionInterface {
- public:
-  std::size_t calls = 0;
-
-  bool setSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::optional<Array>,
-                      bool) override {
-    ++calls;
-    return true;
-  }
-  void startConfigWithCompletionHandler(wire::NamesReply reply) override {
-    answer(reply, std::vector<std::string>{"x"});
-  }
-  void fetchStatesWithUserInfo(wire::OptionalDictionary, wire::NamesReply reply) override {
-    answer(reply, std::nullopt);
-  }
-  void fetchDisplayURL(wire::StringReply reply) override { answer(reply, "URL not available"); }
-  void sendMessageWithCategory(std::uint16_t, std::uint16_t, wire::OptionalDictionary d,
-                               wire::StringReply reply) override {
-    answer(reply, d && d->string("text") ? std::optional(*d->string("text")) : std::nullopt);
-  }
-  void sendMessageWithDictionary(Dictionary, wire::StringReply) override { ++calls; }
-  void flushMessagesWithCompletion(wire::FlushReply reply) override {
-    answer(reply, "flushed", std::nullopt);
-  }
-  void finishSessionWithReply(wire::StringReply reply) override { answer(reply, std::nullopt); }
-  void uploadFileAtPath(std::string, std::string token, wire::BooleanReply reply) override {
-    if (!token.empty()) std::abort();
-    answer(reply, true);
-  }
-  void uploadLogData(Array data, wire::UploadLogDataReply reply) override {
-    answer(reply, data.empty(), wire::makeReportingError("refused", 403));
-  }
-  void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
-                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply reply) override {
-    answer(reply, "finished");
-  }
-  void end() override {}
-  std::string description() const override { return "answering session"; }
-
- private:
-  template <typename R, typename... Results>
-  void answer(const R& reply, Results... results) {
-    ++calls;
-    if (reply) reply(std::move(results)...);
-  }
-};
 
 // The bodies of the frames, whether the end was an impossible one, and the calls that were run.
 using Seen = std::tuple<std::vector<std::string>, bool, std::size_t>;

@@ -4,6 +4,7 @@
 #include <gmock/gmock.h>
 
 #include "base/property_list.h"
+#include "fakes/answering_session.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
 #include "fakes/wire.h"
@@ -19,39 +20,20 @@ inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds ti
   return std::chrono::steady_clock::now() + time;
 }
 
-// Writes each message into the journal and answers it or leaves that to the test; answers uploads, and
-// nothing else.
-class RecordingSession final : public wire::ClientSessionInterface {
+// Writes what comes into the journal; answers a message or leaves that to the test.
+class RecordingSession final : public AnsweringSession {
  public:
   using OnMessage = std::function<void(std::uint16_t category, wire::StringReply)>;
   RecordingSession(Journal& journal, OnMessage onMessage)
       : _journal(journal), _onMessage(std::move(onMessage)) {}
 
-  bool setSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::optional<Array>,
-                      bool) override {
-    return true;
-  }
-  void startConfigWithCompletionHandler(wire::NamesReply) override {}
-  void fetchStatesWithUserInfo(wire::OptionalDictionary, wire::NamesReply) override {}
-  void fetchDisplayURL(wire::StringReply) override {}
   void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, wire::OptionalDictionary payload,
                                wire::StringReply reply) override {
     _journal.add("sendMessage " + std::to_string(category) + " " + std::to_string(type) + " " +
                  (payload ? formats::writeJSON(*payload) : "none"));
     _onMessage ? _onMessage(category, std::move(reply)) : reply("done");
   }
-  void sendMessageWithDictionary(Dictionary, wire::StringReply) override {}
-  void flushMessagesWithCompletion(wire::FlushReply) override {}
-  void finishSessionWithReply(wire::StringReply) override {}
-  void uploadFileAtPath(std::string, std::string, wire::BooleanReply reply) override { reply(true); }
-  void uploadLogData(Array, wire::UploadLogDataReply reply) override {
-    _journal.add("uploadLogData");
-    reply(true, std::nullopt);
-  }
-  void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
-                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply) override {}
   void end() override { _journal.add("end"); }
-  std::string description() const override { return "recording session"; }
 
  private:
   Journal& _journal;

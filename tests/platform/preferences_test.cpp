@@ -33,8 +33,8 @@ TEST_F(FilePreferencesTest, PutsAMalformedFileAsideWithOneLineAndGoesOn) {
     _log.expectLine(Level::error, "kept as /preferences/com.florn.veltra.plist.corrupt");
     for (int i = 0; i < 2; ++i) EXPECT_FALSE(_preferences.value(kDomain, "a"));
     EXPECT_EQ(_files.bytes(std::string(kPath) + ".corrupt"), bytes);
-    EXPECT_TRUE(_preferences.setValue(kDomain, "a", 1));
-    EXPECT_EQ(_preferences.text(kDomain, "a"), "1");
+    const auto made = _preferences.textOrStore(kDomain, "a", platform::randomUUIDText);
+    EXPECT_EQ(_preferences.text(kDomain, "a"), made);
   }
 }
 
@@ -44,7 +44,7 @@ TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {
   _log.expectLine(Level::error, "Preferences could not be read, defaults serve: /preferences/");
   _log.expectLine(Level::error, "Preference not stored, its file cannot be read: /preferences/");
   EXPECT_FALSE(_preferences.value(kDomain, "kept"));
-  EXPECT_FALSE(_preferences.setValue(kDomain, "new", 1));
+  EXPECT_TRUE(_preferences.textOrStore(kDomain, "new", platform::randomUUIDText));
   _files.failReads(kPath, {});
   EXPECT_EQ(_preferences.text(kDomain, "kept"), "1");
 }

@@ -11,7 +11,7 @@ namespace veltrad::backends {
 
 namespace {
 // A location is much shorter.
-constexpr std::size_t kMostAnswerBytes = 1u << 20;
+constexpr std::size_t kMostLogAnswerBytes = 1u << 20;
 
 // Nothing if memory is short.
 std::optional<std::string> archiveOf(const Array& logData) {
@@ -56,7 +56,7 @@ Result<std::string, std::string> LogDataUploads::post(const std::string& url, st
   request.url = url;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body = std::move(archive);
-  request.mostResponseBytes = kMostAnswerBytes;
+  request.mostResponseBytes = kMostLogAnswerBytes;
   http::HTTPResult result = _http.perform(std::move(request));
   if (!result.ok()) return Failure{result.error().description};
   return std::move(result.value().body);

@@ -17,6 +17,9 @@ double finiteOrMinusOne(double seconds);
 // line. Returns how many entries were removed.
 std::size_t restrictEventForJSON(Dictionary& event);
 
+// -1.0 in place of what JSON cannot express.
+double finiteOrMinusOne(double seconds);
+
 struct JSONMessage {
   std::string compact;
   // Only if it was requested.

@@ -34,14 +34,7 @@ int writeNew(const std::string& path, std::string_view text) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (!file.isOpen()) return errno;
   int error = ::fchmod(file.get(), 0600) == 0 ? 0 : errno;
-  while (error == 0 && !text.empty()) {
-    const ssize_t written = ::write(file.get(), text.data(), text.size());
-    if (written >= 0) {
-      text.remove_prefix(static_cast<std::size_t>(written));
-    } else if (errno != EINTR) {
-      error = errno;
-    }
-  }
+  if (error == 0) error = writeAll(file.get(), text);
   if (::close(file.release()) != 0 && error == 0) error = errno;
   if (error != 0) ::unlink(path.c_str());
   return error;

@@ -101,10 +101,10 @@ std::string contentOf(const std::string& path, const std::string& name, const Re
   const std::string size = fmt::format("{} bytes", bytes.value().size());
   if (!name.ends_with(".plist") && !name.ends_with(".json")) return cannot(size + ", no property list");
   auto list = formats::parsePropertyList(bytes.value());
-  auto json =
-      list ? Result<Value, formats::JSONError>(std::move(list.value())) : formats::parseJSON(bytes.value());
+  auto json = list ? Result<Value, formats::JSONError>(std::move(list.value()))
+                   : formats::parseJSONWithComments(bytes.value());
   if (!json)
-    return cannot(size + "; as a property list: " + list.error().detail +
+    return cannot(size + "; as a property list: " + list.error().description() +
                   "; as JSON: " + json.error().detail);
   const Dictionary* dictionary = json.value().asDictionary();
   const bool isDevice = dictionary && (name == "device.plist" || name == "device.json");

@@ -11,7 +11,7 @@ namespace {
 
 // An argument of inflateInit2.
 constexpr int kGzipAlone = 31;
-constexpr std::size_t kPieceBytes = 64u << 10;
+constexpr std::size_t kReadBytes = 64u << 10;
 
 std::string hexDigest(EVP_MD_CTX* context) {
   unsigned char digest[EVP_MAX_MD_SIZE];
@@ -46,7 +46,7 @@ void UploadDigest::unpack(std::string_view piece) {
     _problem = "bytes behind the gzip stream";
     return;
   }
-  unsigned char plain[kPieceBytes];
+  unsigned char plain[kReadBytes];
   _stream->next_in = reinterpret_cast<unsigned char*>(const_cast<char*>(piece.data()));
   _stream->avail_in = static_cast<unsigned>(piece.size());
   do {
