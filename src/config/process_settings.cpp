@@ -4,15 +4,13 @@
 #include <algorithm>
 #include <utility>
 
+#include "config/preference_keys.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
 #include "support/device_identity.h"
 
 namespace veltrad::config {
 namespace {
-
-constexpr std::uint32_t kEnvironmentCount = 5;
-constexpr std::uint32_t kInternalEnvironment = 2;
 
 constexpr const char* kInternalStorebagHost = "storebags.internal.example";
 constexpr const char* kPublicStorebagHost = "storebags.example";
@@ -49,7 +47,8 @@ std::optional<std::uint32_t> ProcessSettings::currentEnvironment() {
 }
 
 std::optional<ProcessSettings::Environment> ProcessSettings::userDefaultsEnvironment() {
-  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "environmentType");
+  const auto preference =
+      _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kEnvironmentType);
   if (!preference) return std::nullopt;
   const auto stored = preference.value() ? preference.value()->toUInt32() : std::nullopt;
   if (stored && *stored >= kEnvironmentCount) return Environment{kInternalEnvironment, stored};
@@ -68,7 +67,7 @@ std::optional<std::string> ProcessSettings::storebagServerURL() {
   }
   std::optional<std::string> found;
   if (preferred) {
-    const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
+    const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kStorebagURL);
     if (!preference) return std::nullopt;
     found = preference.value() ? preference.value()->toText() : std::nullopt;
   }

@@ -19,8 +19,6 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
-constexpr std::uint32_t kSeedEnvironment = 3;  // of ProcessSettings::currentEnvironment
-
 // Each setting is computed at its first call and kept: a preference that changes later takes effect at the
 // next start. During a shortage a setting is absent, and a later call computes it. What the constructor takes
 // must outlive it.

@@ -6,6 +6,7 @@
 
 #include "config/client_types.h"
 #include "config/operator_settings.h"
+#include "config/preference_keys.h"
 #include "config/process_settings.h"
 #include "config/storebag_content.h"
 #include "config/storebag_store.h"
@@ -60,7 +61,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return {};
+    StorebagSectionAnswer none;
+    none.cause = StorebagCause::noName;
+    none.why = "client type " + std::to_string(clientType) + " has no storebag";
+    return none;
   }
   const auto choices = _choices.current();
   if (!choices) {
@@ -84,6 +88,8 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
     answer.attempted = false;
+    answer.cause = StorebagCause::noAttempt;
+    answer.why = "the environment cannot be read just now";
     return answer;
   }
   const Storebag storebag = takeSection(whole.storebag, *environment, answer);
@@ -93,6 +99,11 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
+    if (answer.cause == StorebagCause::none) {
+      answer.cause = StorebagCause::noSection;
+      answer.why = sectionName ? "it has no section \"" + std::string(sectionName) + "\""
+                               : "environment " + std::to_string(*environment) + " names no section";
+    }
     return answer;
   }
   if (storebag.refreshCycle) {
@@ -115,7 +126,7 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   if (kept.known) return kept;
   const auto whole = _download.verifiedStorebag(stored.value()->container);
   if (!whole) {
-    kept.known = whole.error() != StorebagDownload::Refusal::keyOutOfReach;
+    kept.known = whole.error().cause != StorebagCause::noAttempt;
     if (kept.known) _store.remove(name, "its signature cannot be verified");
     return kept;
   }

@@ -3,6 +3,8 @@
 
 #include <fmt/format.h>
 
+#include "base/version.h"
+#include "daemon/refresh.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
 #include "http/http_queue.h"
@@ -30,6 +32,11 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kStatus, Right::observe, &Observers::status},
       {question::kSessions, Right::observe, &Observers::sessions},
       {question::kMetrics, Right::observe, &Observers::metrics},
+      {question::kVersions, Right::observe, &Observers::versions},
+      {question::kConfig, Right::control, &Observers::preferences},
+      {question::kSetConfig, Right::control, &Observers::setPreference},
+      {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
+      {question::kRefresh, Right::control, &Observers::refresh},
   };
   for (const Question& question : kQuestions) {
     if (question.name == name) return &question;
@@ -80,7 +87,11 @@ class Observers::Desk final : public ipc::Observer {
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started)
-    : _services(services), _agent(agent), _clients(clients), _started(started) {}
+    : _services(services),
+      _agent(agent),
+      _clients(clients),
+      _started(started),
+      _preferences(services.preferences, services.device) {}
 
 bool Observers::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
   connection->setObserver(std::make_shared<Desk>(*this, *connection));
@@ -111,6 +122,28 @@ Observers::Answer Observers::sessions(const Dictionary& arguments) {
 
 Observers::Answer Observers::metrics(const Dictionary&) {
   return Dictionary{{"text", metricsText()}};
+}
+
+Observers::Answer Observers::versions(const Dictionary&) {
+  return Dictionary{{"veltrad", kVersion}, {"libraries", http::transportLibraries()}};
+}
+
+Observers::Answer Observers::preferences(const Dictionary&) {
+  return _preferences.list();
+}
+
+Observers::Answer Observers::setPreference(const Dictionary& arguments) {
+  return _preferences.set(arguments);
+}
+
+Observers::Answer Observers::unsetPreference(const Dictionary& arguments) {
+  return _preferences.unset(arguments);
+}
+
+Observers::Answer Observers::refresh(const Dictionary& arguments) {
+  const std::string* name = arguments.string("name");
+  if (!name) return Failure{std::string("argument \"name\" must be a text")};
+  return refreshStorebag(_agent.storebags(), *name);
 }
 
 Gauges Observers::gauges() {

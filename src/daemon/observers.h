@@ -6,6 +6,7 @@
 
 #include "base/result.h"
 #include "base/value.h"
+#include "config/preference_editor.h"
 #include "daemon/metrics.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
@@ -43,12 +44,18 @@ class Observers final : public ipc::ListenerDelegate {
   Answer status(const Dictionary& arguments);
   Answer sessions(const Dictionary& arguments);
   Answer metrics(const Dictionary& arguments);
+  Answer versions(const Dictionary& arguments);
+  Answer preferences(const Dictionary& arguments);
+  Answer setPreference(const Dictionary& arguments);
+  Answer unsetPreference(const Dictionary& arguments);
+  Answer refresh(const Dictionary& arguments);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
   const double _started;
+  config::PreferenceEditor _preferences;
 };
 
 }  // namespace veltrad::daemon

@@ -66,6 +66,7 @@ class CurlTransfer {
   void collectHeader(std::string_view line);
   bool answerTooLarge() const { return _received > _request.mostResponseBytes; }
   HTTPError::Kind kindOf(CURLcode code) const;
+  HTTPError::Cause causeOf(CURLcode code) const;
   std::string describe(CURLcode code) const;
 
   static curl_socket_t openSocket(void* self, curlsocktype, curl_sockaddr* address);

@@ -31,7 +31,24 @@ enum class Command {
   uploadLogData,
   stats,
   status,
-  metrics
+  metrics,
+  config,
+  configGet,
+  configSet,
+  configUnset,
+  refresh,
+  report
+};
+
+// Of the commands for those who look after a device.
+struct Care {
+  bool watch = false;
+  // config: a preference's name; refresh: a storebag's, empty for all.
+  std::string key;
+  std::string value;
+  // report: the file to write.
+  std::optional<std::string> output;
+  bool yes = false;
 };
 
 // The command's options and arguments, by name.
@@ -47,7 +64,7 @@ struct Options {
   std::uint32_t flag = 0;
   std::optional<Dictionary> payload;
   std::string file;
-  bool watch = false;
+  Care care;
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line. The status is 2
