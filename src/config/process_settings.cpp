@@ -29,26 +29,32 @@ bool looksLikeHost(const std::string& text) {
   });
 }
 
-// Empty where there is none to go by; nothing: it cannot be read just now.
-std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::string& path) {
+// Empty where there is none to go by, and then `problem` says why if the file is there; nothing: it cannot be
+// read just now.
+std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::string& path,
+                                         std::string& problem) {
   const auto bytes = files.read(path);
   if (!bytes) {
     if (bytes.error().passes()) return std::nullopt;
-    if (bytes.error().kind != platform::FileFailure::Kind::notFound)
-      logWarning("storebagServerURL: %s; using the built-in hosts", bytes.error().description.c_str());
+    if (bytes.error().kind != platform::FileFailure::Kind::notFound) problem = bytes.error().description;
     return Dictionary();
   }
   const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
-  if (dictionary == nullptr) {
-    logWarning("storebagServerURL: %s: %s; using the built-in hosts", path.c_str(),
-               list ? "not a dictionary" : list.error().detail.c_str());
-    return Dictionary();
-  }
-  return *dictionary;
+  if (dictionary != nullptr) return *dictionary;
+  problem = path + ": " + (list ? "not a dictionary" : list.error().detail);
+  return Dictionary();
 }
 
 }  // namespace
+
+bool isExampleStorebagURL(std::string_view url) {
+  constexpr std::string_view kScheme = "https://";
+  if (!url.starts_with(kScheme)) return false;
+  url.remove_prefix(kScheme.size());
+  const std::string_view host = url.substr(0, url.find_first_of("/:"));
+  return host == kInternalStorebagHost || host == kPublicStorebagHost;
+}
 
 ProcessSettings::ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
                                  platform::FileStore& files, std::string deploymentPath)
@@ -110,16 +116,28 @@ bool ProcessSettings::isInternalBuild() {
 std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   const char* builtIn = internalBuild ? kInternalStorebagHost : kPublicStorebagHost;
   const char* key = internalBuild ? "internalStorebagHost" : "publicStorebagHost";
-  const std::optional<Dictionary> deployment = readDeployment(_files, _deploymentPath);
+  std::string problem;
+  const std::optional<Dictionary> deployment = readDeployment(_files, _deploymentPath, problem);
   if (!deployment) return std::nullopt;
+  if (!problem.empty()) complain(std::move(problem), "the built-in hosts");
   const std::string* host = deployment->string(key);
   if (host == nullptr) return builtIn;
   if (!looksLikeHost(*host)) {
-    logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s", _deploymentPath.c_str(),
-               key, host->c_str(), builtIn);
+    complain(_deploymentPath + ": " + key + " is \"" + *host + "\", expected a host name", builtIn);
     return builtIn;
   }
   return *host;
+}
+
+void ProcessSettings::complain(std::string problem, const char* hosts) {
+  logWarning("storebagServerURL: %s; using %s", problem.c_str(), hosts);
+  const Lock held(_mutex);
+  _deploymentProblem = std::move(problem);
+}
+
+std::string ProcessSettings::deploymentProblem() {
+  const Lock held(_mutex);
+  return _deploymentProblem;
 }
 
 }  // namespace veltrad::config

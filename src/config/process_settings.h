@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "base/mutex.h"
 
@@ -17,6 +18,9 @@ class DeviceIdentity;
 }  // namespace veltrad::support
 
 namespace veltrad::config {
+
+// Whether the address is that of a host which stands in for one that nobody has named.
+bool isExampleStorebagURL(std::string_view url);
 
 // Each setting is computed at the first call for it and kept: a preference that changes later takes effect at
 // the next start. What cannot be computed for a shortage is nothing for now, and computed at a later call.
@@ -32,6 +36,8 @@ class ProcessSettings {
   std::optional<std::uint32_t> currentEnvironment();
   // No slash at its end, unless the preference has one.
   std::optional<std::string> storebagServerURL();
+  // What is wrong with the deployment file, as it was when the address was computed; empty: nothing is known.
+  std::string deploymentProblem();
   bool isInternalBuild();
 
  private:
@@ -43,6 +49,7 @@ class ProcessSettings {
   std::optional<Environment> userDefaultsEnvironment();
   std::optional<std::string> computeStorebagServerURL();
   std::optional<std::string> storebagHost(bool internalBuild);
+  void complain(std::string problem, const char* hosts);
 
   // Constant after construction.
   platform::Preferences& _preferences;
@@ -53,6 +60,7 @@ class ProcessSettings {
   Mutex _mutex LEAF_LOCK{LockRank::leaf};  // what was computed first is kept
   std::optional<std::uint32_t> _environment GUARDED_BY(_mutex);
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
+  std::string _deploymentProblem GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::config

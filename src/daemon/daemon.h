@@ -19,6 +19,8 @@ class Daemon {
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
+  config::ProcessSettings& settings() { return _settings; }
+  config::StorebagSource& storebags() { return _storebags; }
 
  private:
   support::Veltra _library;

@@ -3,6 +3,7 @@
 
 #include <fmt/format.h>
 
+#include "daemon/doctor.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
 #include "http/http_queue.h"
@@ -23,6 +24,8 @@ struct Observers::Question {
   std::string_view name;
   Right right;
   Answer (Observers::*answer)(const Dictionary& arguments);
+  // Instead, where the answer depends on who asks.
+  Answer (Observers::*answerTo)(const Dictionary& arguments, ipc::Connection& caller) = nullptr;
 };
 
 const Observers::Question* Observers::questionNamed(const std::string& name) {
@@ -30,6 +33,7 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kStatus, Right::observe, &Observers::status},
       {question::kSessions, Right::observe, &Observers::sessions},
       {question::kMetrics, Right::observe, &Observers::metrics},
+      {question::kDoctor, Right::observe, nullptr, &Observers::doctor},
   };
   for (const Question& question : kQuestions) {
     if (question.name == name) return &question;
@@ -47,8 +51,7 @@ class Observers::Desk final : public ipc::Observer {
                                  std::shared_ptr<ipc::PendingReply> reply) override {
     const Question* question = questionNamed(operation);
     if (!question) return ipc::unknownOperation(operation);
-    Answer answer =
-        may(question->right) ? (_observers.*question->answer)(arguments) : refused(question->right);
+    Answer answer = may(question->right) ? answered(*question, arguments) : refused(question->right);
     if (!reply) return std::nullopt;
     if (answer) {
       reply->answer(std::move(answer.value()));
@@ -59,6 +62,10 @@ class Observers::Desk final : public ipc::Observer {
   }
 
  private:
+  Answer answered(const Question& question, const Dictionary& arguments) {
+    return question.answerTo ? (_observers.*question.answerTo)(arguments, _connection)
+                             : (_observers.*question.answer)(arguments);
+  }
   bool holds(const char* entitlement) {
     const auto value = _connection.valueForEntitlement(entitlement);
     return value && value->isBoolean() && *value->toBoolean();
@@ -79,8 +86,9 @@ class Observers::Desk final : public ipc::Observer {
   ipc::Connection& _connection;
 };
 
-Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started)
-    : _services(services), _agent(agent), _clients(clients), _started(started) {}
+Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
+                     double started)
+    : _services(services), _agent(agent), _clients(clients), _doctor(doctor), _started(started) {}
 
 bool Observers::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
   connection->setObserver(std::make_shared<Desk>(*this, *connection));
@@ -111,6 +119,17 @@ Observers::Answer Observers::sessions(const Dictionary& arguments) {
 
 Observers::Answer Observers::metrics(const Dictionary&) {
   return Dictionary{{"text", metricsText()}};
+}
+
+Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection& caller) {
+  std::vector<std::int32_t> types;
+  const Array* asked = arguments.array("clientTypes");
+  for (const Value& value : asked ? *asked : Array()) {
+    const auto type = value.toInt32();
+    if (!type) return Failure{std::string("argument \"clientTypes\" must hold numbers")};
+    types.push_back(*type);
+  }
+  return _doctor.examine(caller, _agent.storebags(), types);
 }
 
 Gauges Observers::gauges() {

@@ -16,6 +16,7 @@ class Listener;
 
 namespace veltrad::daemon {
 
+class Doctor;
 class VeltradAgent;
 
 // Each connection's thread asks on its own. Nothing of it opens a session or a transaction. What the
@@ -23,7 +24,7 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started);
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -43,11 +44,13 @@ class Observers final : public ipc::ListenerDelegate {
   Answer status(const Dictionary& arguments);
   Answer sessions(const Dictionary& arguments);
   Answer metrics(const Dictionary& arguments);
+  Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
+  Doctor& _doctor;
   const double _started;
 };
 

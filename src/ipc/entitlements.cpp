@@ -56,6 +56,7 @@ std::optional<std::string> problemOf(const Value& value) {
 
 struct ReadRules {
   Array rules;
+  bool missing = false;
   std::optional<std::string> shortage;
   std::optional<std::string> error;
   std::vector<std::string> warnings;
@@ -68,7 +69,9 @@ ReadRules readRules(platform::FileStore& files, const std::string& path) {
     const platform::FileFailure& failure = bytes.error();
     if (failure.passes()) {
       read.shortage = failure.description;
-    } else if (failure.kind != platform::FileFailure::Kind::notFound) {
+    } else if (failure.kind == platform::FileFailure::Kind::notFound) {
+      read.missing = true;
+    } else {
       read.error = failure.description;
     }
     return read;
@@ -108,6 +111,14 @@ std::optional<Value> entitlementInRules(const Array& rules, std::string_view nam
   return std::nullopt;
 }
 
+bool anybodyIsGranted(const Array& rules, std::string_view name) {
+  return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
+    if (problemOf(value)) return false;
+    const Value* granted = value.asDictionary()->dictionary("entitlements")->find(name);
+    return granted && granted->isBoolean() && *granted->toBoolean();
+  });
+}
+
 bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
   return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
     const Dictionary* rule = value.asDictionary();
@@ -140,6 +151,7 @@ void Entitlements::refresh(Said& said) {
   said.shortage = std::move(fresh.shortage);
   if (said.shortage) return;
   _rules = std::move(fresh.rules);
+  _state = {fresh.missing, fresh.error.value_or(""), fresh.warnings, false};
   said.error = std::move(fresh.error);
   said.warnings = std::move(fresh.warnings);
   _stamp = stamp.value();
@@ -156,6 +168,21 @@ std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, co
   }
   say(said);
   return found;
+}
+
+std::optional<RulesState> Entitlements::stateFor(std::string_view name) {
+  Said said;
+  std::optional<RulesState> state;
+  {
+    Lock lock(_mutex);
+    refresh(said);
+    if (!said.shortage) {
+      state = _state;
+      state->grants = anybodyIsGranted(_rules, name);
+    }
+  }
+  say(said);
+  return state;
 }
 
 bool Entitlements::mayHold(std::string_view name, unsigned uid) {

@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/mutex.h"
 #include "base/value.h"
@@ -17,6 +18,14 @@ class FileStore;
 
 namespace veltrad::ipc {
 
+// What the rules give, for those who look for a fault.
+struct RulesState {
+  bool missing = false;               // there is no file
+  std::string error;                  // why it cannot be used; empty: it can
+  std::vector<std::string> warnings;  // about single rules
+  bool grants = false;                // some rule grants the entitlement to somebody
+};
+
 // The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
 // rule with more than one of the three matches when all of them match, one with none never. A missing or
 // unreadable file grants nothing; an unreadable or malformed one is one error line a change. For a shortage
@@ -26,6 +35,8 @@ class Entitlements {
   Entitlements(platform::FileStore& files, std::string path);
   // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
+  // How the file stands, and whether anybody is granted this. Nothing: it cannot be read just now.
+  std::optional<RulesState> stateFor(std::string_view name);
   // False: no rule grants it to this user, whatever groups and unit a process of his has.
   bool mayHold(std::string_view name, unsigned uid);
 
@@ -40,10 +51,12 @@ class Entitlements {
   std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
   bool _read GUARDED_BY(_mutex) = false;
   Array _rules GUARDED_BY(_mutex);
+  RulesState _state GUARDED_BY(_mutex);  // of that reading, without `grants`
   platform::LimitedLine _shortages{"questions"};
 };
 
 // The decisions alone; exposed for their tables of tests.
+bool anybodyIsGranted(const Array& rules, std::string_view name);
 bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid);
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer);
 

@@ -48,6 +48,10 @@ class DiskFileStore final : public FileStore {
 // Makes the directory and its parents (mode 0755) where they are missing.
 Result<Done, FileFailure> makeDirectories(const std::string& path);
 
+// Whether files can be made in the directory, which is made where it is missing: by making one and removing
+// it.
+Result<Done, FileFailure> tryWritingIn(const std::string& directory);
+
 // Removes what a replace() that was killed has left in the directory: regular files under its pattern of
 // names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.
 std::size_t removeUnfinishedFiles(const std::string& directory);

@@ -1,6 +1,7 @@
 // veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
 
+#include "tools/ctl/doctor_command.h"
 #include "tools/ctl/options.h"
 #include "tools/ctl/send_command.h"
 #include "tools/ctl/session_command.h"
@@ -22,6 +23,8 @@ int main(int argc, char** argv) {
       return runStats(options);
     case Command::status:
       return runStatus(options, interrupt);
+    case Command::doctor:
+      return runDoctor(options);
     case Command::metrics:
       return runMetrics(options);
     case Command::session:

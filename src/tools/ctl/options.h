@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <variant>
+#include <vector>
 
 #include "base/value.h"
 
@@ -31,7 +32,8 @@ enum class Command {
   uploadLogData,
   stats,
   status,
-  metrics
+  metrics,
+  doctor
 };
 
 // The command's options and arguments, by name.
@@ -48,6 +50,7 @@ struct Options {
   std::optional<Dictionary> payload;
   std::string file;
   bool watch = false;
+  std::vector<std::int32_t> clientTypes;
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line. The status is 2
