@@ -25,6 +25,14 @@ bool looksLikeHost(const std::string& text) {
 
 }  // namespace
 
+bool isExampleStorebagURL(std::string_view url) {
+  constexpr std::string_view kScheme = "https://";
+  if (!url.starts_with(kScheme)) return false;
+  url.remove_prefix(kScheme.size());
+  const std::string_view host = url.substr(0, url.find_first_of("/:"));
+  return host == kInternalStorebagHost || host == kPublicStorebagHost;
+}
+
 ProcessSettings::ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
                                  platform::FileStore& files, const std::string& deploymentPath)
     : _preferences(preferences), _device(device), _deployment(files, deploymentPath) {}
@@ -125,19 +133,30 @@ std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   if (deployment->kind == Kind::absent) return builtIn;
   const Dictionary* hosts = deployment->kind == Kind::good ? deployment->value.asDictionary() : nullptr;
   if (hosts == nullptr) {
-    logWarning("storebagServerURL: %s; using the built-in hosts",
-               deployment->kind == Kind::broken ? deployment->error.c_str()
-                                                : (deployment->placeOf({}) + ": not a dictionary").c_str());
+    complain(
+        deployment->kind == Kind::broken ? deployment->error : deployment->placeOf({}) + ": not a dictionary",
+        "the built-in hosts");
     return builtIn;
   }
   const std::string* host = hosts->string(key);
   if (host == nullptr) return builtIn;
   if (!looksLikeHost(*host)) {
-    logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s",
-               deployment->placeOf({key}).c_str(), key, host->c_str(), builtIn);
+    complain(deployment->placeOf({key}) + ": " + key + " is \"" + *host + "\", expected a host name",
+             builtIn);
     return builtIn;
   }
   return *host;
+}
+
+void ProcessSettings::complain(std::string problem, const char* hosts) {
+  logWarning("storebagServerURL: %s; using %s", problem.c_str(), hosts);
+  const Lock held(_mutex);
+  _deploymentProblem = std::move(problem);
+}
+
+std::string ProcessSettings::deploymentProblem() {
+  const Lock held(_mutex);
+  return _deploymentProblem;
 }
 
 }  // namespace veltrad::config

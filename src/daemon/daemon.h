@@ -26,6 +26,8 @@ class Daemon {
   backends::BackendFactory& backends() { return _factory; }
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
+  config::ProcessSettings& settings() { return _settings; }
+  config::StorebagSource& storebags() { return _storebags; }
 
  private:
   Services& _services;

@@ -7,9 +7,11 @@
 #include <cstdio>
 #include <optional>
 #include <string_view>
+#include <utility>
 
 #include "base/version.h"
 #include "daemon/daemon.h"
+#include "daemon/doctor.h"
 #include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
@@ -80,8 +82,8 @@ void removeUnfinishedFiles(const platform::Root& root) {
   }
 }
 
-void enterSandbox(const platform::Root& root) {
-  const auto entered = platform::enterSandbox(platform::veltradSandboxProfile(root));
+platform::SandboxState enterSandbox(const platform::Root& root) {
+  auto entered = platform::enterSandbox(platform::veltradSandboxProfile(root));
   if (!entered.ok()) {
     logError("main: %s\n", entered.error().c_str());
     _exit(255);
@@ -91,6 +93,7 @@ void enterSandbox(const platform::Root& root) {
   } else {
     logWarning("main: %s", entered.value().line.c_str());
   }
+  return std::move(entered).value();
 }
 
 struct Sockets {
@@ -205,7 +208,7 @@ int main(int count, char** arguments) {
   daemon::Services services(platform::Root::fromEnvironment());
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
-  enterSandbox(services.root);
+  auto sandbox = enterSandbox(services.root);
   auto sockets = openSockets(services);
   if (!sockets) {
     logError("main: %s", sockets.error().c_str());
@@ -220,7 +223,8 @@ int main(int count, char** arguments) {
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
                           services.counters, services.memory, services.root.entitlementsPath()},
                          daemon.agent());
-  daemon::Observers observers(services, daemon.agent(), listener, started);
+  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, started);
   ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
                          services.counters, services.observersMemory, services.root.entitlementsPath(),
                          kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},

@@ -17,6 +17,7 @@ class Listener;
 
 namespace veltrad::daemon {
 
+class Doctor;
 class VeltradAgent;
 
 // Each connection's thread asks on its own. Nothing of it opens a session or a transaction. What the
@@ -24,7 +25,7 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started);
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -49,11 +50,13 @@ class Observers final : public ipc::ListenerDelegate {
   Answer setPreference(const Dictionary& arguments);
   Answer unsetPreference(const Dictionary& arguments);
   Answer refresh(const Dictionary& arguments);
+  Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
+  Doctor& _doctor;
   const double _started;
   config::PreferenceEditor _preferences;
 };

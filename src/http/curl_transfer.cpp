@@ -130,7 +130,9 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_OPENSOCKETDATA, this);
   options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
   options.set(CURLOPT_CLOSESOCKETDATA, _connections);
-  options.set(CURLOPT_FRESH_CONNECT, metEndedConnection() ? 1L : 0L);
+  // Who asks for a storebag is told whether its server is trusted now, not when a kept connection was made.
+  const bool fresh = metEndedConnection() || _request.lane == HTTPRequest::Lane::storebag;
+  options.set(CURLOPT_FRESH_CONNECT, fresh ? 1L : 0L);
   _connection = Connection::kept;
   _error[0] = '\0';
   options.set(CURLOPT_ERRORBUFFER, _error.data());

@@ -208,6 +208,14 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
   return Done();
 }
 
+Result<Done, FileFailure> tryWritingIn(const std::string& directory) {
+  if (auto made = makeDirectories(directory); !made) return made;
+  const std::string path = directory + "/tried." + randomUUIDText().substr(0, 8) + ".new";
+  if (const int error = writeNewFile(path, ".", {})) return Failure{failureOf(directory, error)};
+  ::unlink(path.c_str());
+  return Done();
+}
+
 std::size_t removeUnfinishedFiles(const std::string& directory) {
   std::size_t removed = 0;
   std::error_code failure;

@@ -67,6 +67,12 @@ int giveToOwnerOfDirectory(int file, const std::string& path);
 
 // Removes the files that killed replace() calls left in the directory: NAME.XXXXXXXX.new with eight
 // hexadecimal digits. Returns how many. To be called before anything else writes there.
+// Whether files can be made in the directory, which is made where it is missing: by making one and removing
+// it.
+Result<Done, FileFailure> tryWritingIn(const std::string& directory);
+
+// Removes what a replace() that was killed has left in the directory: regular files under its pattern of
+// names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.
 std::size_t removeUnfinishedFiles(const std::string& directory);
 
 }  // namespace veltrad::platform

@@ -33,6 +33,14 @@ inline constexpr const char* kUnsetConfig = "unsetConfig";
 inline constexpr const char* kVersions = "versions";
 }  // namespace question
 
+// The checks of `veltractl doctor`, in their order. The first one is veltractl's own, the daemon decides the
+// others.
+namespace check {
+inline constexpr const char* kNames[] = {
+    "daemon",      "entitlement", "storebagAddress", "nameResolution", "trust",   "storebag",    "signature",
+    "environment", "clientTypes", "consent",         "messageLog",     "sandbox", "descriptors", "clock"};
+}  // namespace check
+
 // What the daemon calls.
 namespace event {
 inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";

@@ -2,6 +2,7 @@
 #include <cstdio>
 
 #include "tools/ctl/config_command.h"
+#include "tools/ctl/doctor_command.h"
 #include "tools/ctl/options.h"
 #include "tools/ctl/refresh_command.h"
 #include "tools/ctl/report_command.h"
@@ -25,6 +26,8 @@ int main(int argc, char** argv) {
       return runStats(options);
     case Command::status:
       return runStatus(options, interrupt);
+    case Command::doctor:
+      return runDoctor(options);
     case Command::metrics:
       return runMetrics(options);
     case Command::config:

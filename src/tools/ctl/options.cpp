@@ -20,7 +20,7 @@ namespace {
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
-    "metrics, config, refresh or report";
+    "metrics, doctor, config, refresh or report";
 
 // Arguments in text form.
 struct Texts {
@@ -187,6 +187,34 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
 }
 
 constexpr const char* kCareGroup = "Looking after a device";
+void addDoctor(CLI::App& app, Options& options, const char* group) {
+  CLI::App* doctor = addCommand(app, options, Command::doctor, "doctor",
+                                "Check everything that stands between this device and its first report")
+                         ->group(group);
+  const auto add = [&options](const std::string& text) {
+    std::int32_t type = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), type);
+    if (error != std::errc() || end != text.data() + text.size() || type < 0) {
+      throw CLI::ValidationError(
+          "--client-type", fmt::format("expected a client type, 0 to 17, found \"{}\"", escapedForLog(text)));
+    }
+    options.care.clientTypes.push_back(type);
+  };
+  doctor
+      ->add_option_function<std::vector<std::string>>(
+          "--client-type",
+          [add](const std::vector<std::string>& texts) {
+            for (const std::string& text : texts) add(text);
+          },
+          "Look at this client type's storebag; repeat the option for more. Without it at those that\n"
+          "sessions have asked for since the start, else at all")
+      ->type_name("N");
+  doctor->footer(
+      "Prints each check with ok, warning, failure or skipped, and what to do. The exit status is 1 exactly "
+      "if\n"
+      "there is a failure. Storebags are fetched anew, and what comes is used for nothing else.\n\n"
+      "Examples:\n  veltractl doctor\n  veltractl doctor --client-type 7 --json");
+}
 
 // For those who look after a device.
 void addConfig(CLI::App& app, Options& options) {
@@ -258,6 +286,7 @@ void addObservation(CLI::App& app, Options& options) {
       ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
   addConfig(app, options);
   addRefreshAndReport(app, options);
+  addDoctor(app, options, group);
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
                                "Show what happened to messages, by reason, with counts")
                         ->group(group);
@@ -291,7 +320,8 @@ void addGlobals(CLI::App& app, Options& options) {
       ->check(CLI::Validator(
           [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
           ""));
-  app.add_flag("--json", options.json, "Print status and stats as JSON; what opens a session always does");
+  app.add_flag("--json", options.json,
+               "Print status, stats and doctor as JSON; what opens a session always does");
   app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
   app.set_help_flag("-h,--help", "Print this help");
   app.require_subcommand(1);

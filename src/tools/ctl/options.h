@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <variant>
+#include <vector>
 
 #include "base/value.h"
 
@@ -32,6 +33,7 @@ enum class Command {
   stats,
   status,
   metrics,
+  doctor,
   config,
   configGet,
   configSet,
@@ -43,6 +45,8 @@ enum class Command {
 // Of the commands for those who look after a device.
 struct Care {
   bool watch = false;
+  // doctor.
+  std::vector<std::int32_t> clientTypes;
   // config: a preference's name; refresh: a storebag's, empty for all.
   std::string key;
   std::string value;
