@@ -19,12 +19,15 @@ StateFile::StateFile(State state, FileStore& files, DiskWriter& writer, std::str
 
 bool StateFile::writeSoon() {
   const Version version = _state.version();
-  if ((_written == version && !_failed) || _asked.exchange(true)) return true;
+  {
+    const Lock held(_mutex);
+    if (_written == version) return true;
+  }
+  if (_asked.exchange(true)) return true;
   if (_queue.put([this] { write(); }, 1) == DiskWriter::Queue::Put::noThread) {
     _asked = false;
     return false;
   }
-  _written = version;
   return true;
 }
 
@@ -35,12 +38,15 @@ bool StateFile::writeLast(std::chrono::steady_clock::time_point deadline) {
 }
 
 void StateFile::write() {
-  _asked = false;  // first, because what changes from now on may need another write
+  _asked = false;                            // first, because what changes from now on may need another write
+  const Version version = _state.version();  // before the text, which may be newer
   const auto written = _files.replace(_path, _state.text(), 0644);
   if (!written && !_failed) {
     logError("%s could not be written: %s", _state.name, written.error().description.c_str());
   }
   _failed = !written;
+  const Lock held(_mutex);
+  _written = written ? std::optional(version) : std::nullopt;
 }
 
 }  // namespace veltrad::platform

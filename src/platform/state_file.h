@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 
+#include "base/mutex.h"
 #include "platform/disk_writer.h"
 
 namespace veltrad::platform {
@@ -23,8 +24,9 @@ class StateFile {
   using Version = std::array<std::uint64_t, 4>;
   struct State {
     const char* name;  // as its line in the log begins: "The counters"
+    // Both are called on the disk writer's thread, the first also on the main thread.
     std::function<Version()> version;
-    // What the file holds. Called on the disk writer's thread.
+    // What the file holds.
     std::function<std::string()> text;
   };
 
@@ -44,8 +46,9 @@ class StateFile {
   FileStore& _files;
   DiskWriter& _writer;
   const std::string _path;
-  // Set when a write is asked for; the text that is written later is at least as new.
-  std::optional<Version> _written;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  // The text in the file is at least as new. Absent after a failure.
+  std::optional<Version> _written GUARDED_BY(_mutex);
   std::atomic<bool> _asked{false};
   std::atomic<bool> _failed{false};
   DiskWriter::Queue _queue;
