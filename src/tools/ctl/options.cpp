@@ -273,13 +273,9 @@ void putTogether(const Texts& texts, Options& options) {
   options.identity.userInfo = std::move(userInfo);
 }
 
-}  // namespace
-
-std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
-  Options options;
-  Texts texts;
-  CLI::App app("Start veltrad sessions, send messages, upload files and see what happened to them.",
-               "veltractl");
+void describe(CLI::App& app, Options& options, Texts& texts) {
+  app.name("veltractl");
+  app.description("Start veltrad sessions, send messages, upload files and see what happened to them.");
   addGlobals(app, options);
   addSession(app, options, texts);
   addSend(app, options, texts);
@@ -287,6 +283,15 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   addQuestions(app, options, texts);
   addUploads(app, options, texts);
   addObservation(app, options);
+}
+
+}  // namespace
+
+std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
+  Options options;
+  Texts texts;
+  CLI::App app;
+  describe(app, options, texts);
   try {
     app.parse(argc, argv);
   } catch (const CLI::ParseError& error) {
@@ -294,6 +299,14 @@ std::variant<Options, Ending> parseOptions(int argc, const char* const* argv) {
   }
   putTogether(texts, options);
   return options;
+}
+
+tools::CommandLine commandLine() {
+  Options options;
+  Texts texts;
+  CLI::App app;
+  describe(app, options, texts);
+  return tools::commandLineOf(app);
 }
 
 }  // namespace veltrad::ctl

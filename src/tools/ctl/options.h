@@ -7,6 +7,7 @@
 #include <variant>
 
 #include "base/value.h"
+#include "tools/command_line.h"
 
 namespace veltrad::ctl {
 
@@ -59,5 +60,8 @@ struct Ending {
 };
 
 std::variant<Options, Ending> parseOptions(int argc, const char* const* argv);
+
+// For the reference pages.
+tools::CommandLine commandLine();
 
 }  // namespace veltrad::ctl
