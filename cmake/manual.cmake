@@ -1,6 +1,4 @@
 # Manual pages, made from docs/reference by pandoc, and completions; both are installed with the program that they are for.
-include(GNUInstallDirs)
-
 install(FILES ${PROJECT_SOURCE_DIR}/packaging/completions/veltractl.bash RENAME veltractl
         DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions COMPONENT tools)
 install(FILES ${PROJECT_SOURCE_DIR}/packaging/completions/_veltractl
@@ -34,7 +32,7 @@ file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
 veltra_manual_pages(daemon veltrad.8 veltrad.5)
 veltra_manual_pages(tools veltractl.1 veltra-storebag.1 veltra-storebag.5)
 veltra_manual_pages(development libveltra.3)
-if(NOT DEFINED VELTRA_LAB OR VELTRA_LAB)
+if(VELTRA_LAB)
   veltra_manual_pages(lab veltra-lab.1)
 endif()
 get_property(pages GLOBAL PROPERTY VELTRA_MANUAL_PAGES)

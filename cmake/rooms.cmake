@@ -4,11 +4,23 @@
 # contains only a link to src/ROOM. An include that points up the ladder therefore does not compile.
 
 add_library(veltra_options INTERFACE)
-target_compile_options(veltra_options INTERFACE -Wall -Wextra -Wconversion -Werror -fno-omit-frame-pointer)
-target_compile_options(veltra_options INTERFACE
-  $<$<COMPILE_LANG_AND_ID:CXX,Clang>:-Wthread-safety -Wthread-safety-beta>)
-# GCC 12 reports overlaps in std::string's operator+ and uninitialized members in moved variants that do not exist.
-target_compile_options(veltra_options INTERFACE "$<$<COMPILE_LANG_AND_ID:CXX,GNU>:-Wno-restrict;-Wno-maybe-uninitialized>")
+if(VELTRA_WARNINGS)
+  target_compile_options(veltra_options INTERFACE -Wall -Wextra -Wconversion -Werror)
+endif()
+target_compile_options(veltra_options INTERFACE -fno-omit-frame-pointer)
+if(VELTRA_WARNINGS)
+  target_compile_options(veltra_options INTERFACE
+    $<$<COMPILE_LANG_AND_ID:CXX,Clang>:-Wthread-safety -Wthread-safety-beta>)
+  # GCC 12 reports overlaps in std::string's operator+ and uninitialized members in moved variants that do not exist.
+  target_compile_options(veltra_options INTERFACE
+    "$<$<COMPILE_LANG_AND_ID:CXX,GNU>:-Wno-restrict;-Wno-maybe-uninitialized>")
+endif()
+if(NOT CMAKE_BUILD_TYPE STREQUAL "Debug")
+  # What is shipped names no folder in which it was built. The build folder may lie inside the source folder; of two
+  # matching prefixes GCC replaces the one that was given last.
+  target_compile_options(veltra_options INTERFACE
+    -ffile-prefix-map=${PROJECT_SOURCE_DIR}=. -ffile-prefix-map=${PROJECT_BINARY_DIR}=build)
+endif()
 if(VELTRA_SANITIZE)
   target_compile_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE} -fno-sanitize-recover=all -O1 -g1)
   # The vptr check opens a pipe, so it reports errors in a process that has no free descriptor.
@@ -47,17 +59,17 @@ function(veltra_room name)
   if(ROOM_EXCLUDE)
     list(FILTER sources EXCLUDE REGEX "${ROOM_EXCLUDE}")
   endif()
-  file(MAKE_DIRECTORY ${CMAKE_BINARY_DIR}/rooms/${name})
-  file(CREATE_LINK ${CMAKE_CURRENT_SOURCE_DIR} ${CMAKE_BINARY_DIR}/rooms/${name}/${name} SYMBOLIC)
+  file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/rooms/${name})
+  file(CREATE_LINK ${CMAKE_CURRENT_SOURCE_DIR} ${PROJECT_BINARY_DIR}/rooms/${name}/${name} SYMBOLIC)
   if(sources)
     add_library(veltra_${name} STATIC ${sources})
-    target_include_directories(veltra_${name} PUBLIC ${CMAKE_BINARY_DIR}/rooms/${name})
+    target_include_directories(veltra_${name} PUBLIC ${PROJECT_BINARY_DIR}/rooms/${name})
     target_link_libraries(veltra_${name} PUBLIC ${ROOM_PUBLIC} PRIVATE veltra_options ${ROOM_PRIVATE})
     set_target_properties(veltra_${name} PROPERTIES CXX_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
     veltra_precompile(veltra_${name} room_headers)
   else()
     add_library(veltra_${name} INTERFACE)
-    target_include_directories(veltra_${name} INTERFACE ${CMAKE_BINARY_DIR}/rooms/${name})
+    target_include_directories(veltra_${name} INTERFACE ${PROJECT_BINARY_DIR}/rooms/${name})
     target_link_libraries(veltra_${name} INTERFACE ${ROOM_PUBLIC} ${ROOM_PRIVATE})
   endif()
 endfunction()

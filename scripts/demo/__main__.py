@@ -32,7 +32,7 @@ def stay(root, lab):
     print(f"  {control} send --client-type 6 --client phone --service ringer --require-user-info "
           "--category 5 --type 10 codec=opus seconds=12.5")
     print(f"  {control} stats")
-    print(f"  VELTRA_ROOT={root.path} {program('hello')}")
+    print(f"  VELTRA_ROOT={root.path} {program('veltra-example-hello')}")
     print(f"  open {lab.url}/ in a browser: shows what arrives (the certificate is self-signed by the lab)")
     print(f"  edit {lab.path}/storebags/ostvane.json: the daemon's configuration, signed at each request", flush=True)
     stopped = threading.Event()

@@ -5,15 +5,27 @@
 #include "backends/dashboard/dashboard_backend.h"
 #include "backends/https/https_post_backend.h"
 #include "backends/mivo/mivo_backend.h"
+#include "backends/sampling_factors.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
+#include "platform/random.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
 
 namespace {
 // Devices of this product type have no adaptor.
-constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+[[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+
+// The one draw that a back end takes, decided before.
+class FixedDraw final : public platform::Random {
+ public:
+  explicit FixedDraw(double draw) : _draw(draw) {}
+  double uniform() override { return _draw; }
+
+ private:
+  const double _draw;
+};
 }  // namespace
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
@@ -26,21 +38,28 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
 
 std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    const SessionFacts& facts, bool oneShot) {
+                                                    const SessionFacts& facts,
+                                                    [[maybe_unused]] bool oneShot) {
   const std::string family = productFamily.value_or("");
+  const auto stable =
+      _services.sampling ? _services.sampling->stableFactor(facts.compType, name) : std::nullopt;
+  FixedDraw fixed(stable.value_or(0));
+  platform::Random& random = stable ? fixed : _services.random;
+#ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName({_services.random, _services.clock, _services.counters,
-                                           _services.pool, _logData, _dashboards, facts.account, oneShot},
+    return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
+                                           _logData, _dashboards, facts.account, oneShot},
                                           name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
+#endif
   if (name == wire::kVeltraBackendUploadServer) {
-    return UploadBackend::initWithName({_services.random, _files, _services.http, _services.lentFiles,
-                                        _services.counters, _services.scratchDirectory},
-                                       name, std::get_if<config::UploadProfile>(profile.get()), family);
+    return UploadBackend::initWithName(
+        {random, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
+        name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
     return HTTPSPostBackend::initWithName(
-        {_services.random,
+        {random,
          _services.locale,
          _services.counters,
          _posts,
@@ -48,13 +67,14 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services.energyLog, _services.counters, _services.random, name,
-                                       family);
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, random, name, family);
   }
+#ifdef VELTRA_ADAPTOR
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, _services.random, name,
-                                     family, facts.compType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
+                                     facts.compType);
   }
+#endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   return nullptr;
 }

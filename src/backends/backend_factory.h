@@ -21,9 +21,10 @@ namespace veltrad::backends {
 
 class CodeBundle;
 class EnergyLog;
+class SamplingFactors;
 class WorkPool;
 
-// Its 14 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 15 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -41,6 +42,8 @@ struct BackendServices {
   platform::LentFiles& lentFiles;
   // Where temporary files are made.
   std::string scratchDirectory = "/tmp";
+  // Null: every sampling factor is drawn.
+  SamplingFactors* sampling = nullptr;
 };
 
 // A back end's section of a storebag. Null for a back end that reads no section.
@@ -59,6 +62,8 @@ class BackendFactory {
                                                     const SharedFacts& facts, bool oneShot = false);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest() { _posts.sayRest(); }
+  // Frees memory that is kept for the next message. Called when nothing was sent for a while.
+  void rest() { _posts.rest(); }
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,

@@ -5,6 +5,10 @@
 
 namespace veltrad {
 
+std::string PropertyListError::description() const {
+  return place ? "line " + std::to_string(place->line) + ": " + detail : detail;
+}
+
 std::optional<std::uint64_t> declaredObjects(std::string_view bytes) {
   using namespace binary_property_list;
   if (!bytes.starts_with(kHeader) || bytes.size() < kHeader.size() + kTrailerSize) return std::nullopt;

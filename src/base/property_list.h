@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "base/result.h"
+#include "base/text.h"
 #include "base/value.h"
 
 namespace veltrad {
@@ -34,8 +35,10 @@ struct PropertyListError {
   // reference.
   enum class Kind { notAPropertyList, malformed, tooDeep, tooLarge, overMemory, cyclic, forbidden };
   Kind kind;
-  // One line for the log: what is wrong and where.
-  std::string detail;
+  std::string detail;                   // one line for the log: what is wrong
+  std::optional<TextPlace> place = {};  // where, in an XML list; in a binary one the detail names the object
+  // Both, as one line.
+  std::string description() const;
 };
 
 Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,

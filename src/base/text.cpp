@@ -130,6 +130,19 @@ bool containsIgnoringCase(std::string_view text, std::string_view part) {
   return lowerCase(text).find(lowerCase(part)) != std::string::npos;
 }
 
+TextPlace placeInText(std::string_view text, std::size_t offset) {
+  TextPlace place;
+  for (const char c : text.substr(0, offset)) {
+    if (c == '\n') {
+      ++place.line;
+      place.column = 1;
+    } else if ((static_cast<unsigned char>(c) & 0xc0) != 0x80) {  // no continuation byte
+      ++place.column;
+    }
+  }
+  return place;
+}
+
 std::string_view trimmed(std::string_view text, std::string_view blanks) {
   const std::size_t first = text.find_first_not_of(blanks);
   if (first == std::string_view::npos) return {};

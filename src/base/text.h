@@ -49,6 +49,14 @@ std::string lowerCase(std::string_view text);
 bool equalIgnoringCase(std::string_view a, std::string_view b);
 bool containsIgnoringCase(std::string_view text, std::string_view part);
 
+// Both from 1; the column counts characters.
+struct TextPlace {
+  std::size_t line = 1;
+  std::size_t column = 1;
+};
+// Of the byte at `offset`; of the end for one beyond it. Lines end at "\n".
+TextPlace placeInText(std::string_view text, std::size_t offset);
+
 // Without the characters of `blanks` at either end.
 std::string_view trimmed(std::string_view text, std::string_view blanks = " \t\r\n");
 

@@ -25,6 +25,10 @@ bool fits(const Value& value, KeyType type) {
       return value.toDouble().has_value();
     case KeyType::dictionary:
       return value.asDictionary() != nullptr;
+    case KeyType::boolean:
+      return value.isBoolean();
+    case KeyType::choice:
+      return value.asString() != nullptr;
     case KeyType::presence:
       break;
   }
@@ -78,8 +82,8 @@ void take(const Key&, const Value& value, std::optional<double>& field) {
   field = value.toDouble();
 }
 
-void take(const Key&, const Value&, bool& field) {
-  field = true;
+void take(const Key& key, const Value& value, bool& field) {
+  field = key.type == KeyType::presence || value.toBoolean().value_or(false);
 }
 
 void take(const Key&, const Value& value, std::optional<Dictionary>& field) {

@@ -15,8 +15,21 @@
 namespace veltrad::config {
 
 // url: a text that begins with https://. names: a text of names separated by commas, not trimmed. texts,
-// dictionaries: arrays. presence: any value; only the presence of the key matters.
-enum class KeyType { text, url, names, texts, integer, real, presence, dictionary, dictionaries };
+// dictionaries: arrays. choice: one of a few texts. presence: any value; only the presence of the key
+// matters.
+enum class KeyType {
+  text,
+  url,
+  names,
+  texts,
+  integer,
+  real,
+  presence,
+  dictionary,
+  dictionaries,
+  boolean,
+  choice
+};
 
 // The valid range of a number. The type of the key's field decides how a number outside is read.
 struct Range {
@@ -43,6 +56,7 @@ struct Key {
   // Stores the value in the struct of its table; ignores one of the wrong type. Null if the daemon does not
   // read the key.
   void (*read)(const Key&, const Value&, void* parsed) = nullptr;
+  const char* choices = nullptr;  // the texts of a choice, "|" between them
 };
 
 struct KeyTable : std::span<const Key> {
@@ -72,8 +86,7 @@ void take(const Key& key, const Value& value, std::optional<std::uint16_t>& fiel
 // Clamps to the key's range.
 void take(const Key& key, const Value& value, std::optional<std::int64_t>& field);
 void take(const Key& key, const Value& value, std::optional<double>& field);
-// Presence.
-void take(const Key& key, const Value& value, bool& field);
+void take(const Key& key, const Value& value, bool& field);  // presence, boolean
 void take(const Key& key, const Value& value, std::optional<Dictionary>& field);
 
 // The row of a key of `Parsed`, whose table is Parsed::kKeys.

@@ -4,8 +4,6 @@
 #include <algorithm>
 #include <utility>
 
-#include "formats/property_list.h"
-#include "platform/file_store.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
 #include "support/device_identity.h"
@@ -27,30 +25,11 @@ bool looksLikeHost(const std::string& text) {
   });
 }
 
-// Empty if the file is missing or unusable; absent during a shortage.
-std::optional<Dictionary> readDeployment(platform::FileStore& files, const std::string& path) {
-  const auto bytes = files.read(path);
-  if (!bytes) {
-    if (bytes.error().passes()) return std::nullopt;
-    if (bytes.error().kind != platform::FileFailure::Kind::notFound)
-      logWarning("storebagServerURL: %s; using the built-in hosts", bytes.error().description.c_str());
-    return Dictionary();
-  }
-  const auto list = formats::parsePropertyList(bytes.value());
-  const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
-  if (dictionary == nullptr) {
-    logWarning("storebagServerURL: %s: %s; using the built-in hosts", path.c_str(),
-               list ? "not a dictionary" : list.error().detail.c_str());
-    return Dictionary();
-  }
-  return *dictionary;
-}
-
 }  // namespace
 
 ProcessSettings::ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
-                                 platform::FileStore& files, std::string deploymentPath)
-    : _preferences(preferences), _device(device), _files(files), _deploymentPath(std::move(deploymentPath)) {}
+                                 platform::FileStore& files, const std::string& deploymentPath)
+    : _preferences(preferences), _device(device), _deployment(files, deploymentPath) {}
 
 std::optional<std::uint32_t> ProcessSettings::currentEnvironment() {
   {
@@ -81,20 +60,51 @@ std::optional<ProcessSettings::Environment> ProcessSettings::userDefaultsEnviron
 }
 
 std::optional<std::string> ProcessSettings::storebagServerURL() {
+  bool preferred = true;
   {
     const Lock held(_mutex);
     if (_storebagServerURL) return _storebagServerURL;
+    preferred = !_fromDeployment;
   }
-  auto found = computeStorebagServerURL();
+  std::optional<std::string> found;
+  if (preferred) {
+    const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
+    if (!preference) return std::nullopt;
+    found = preference.value() ? preference.value()->toText() : std::nullopt;
+  }
+  const bool fromDeployment = !found;
+  if (fromDeployment) found = deployedStorebagServerURL();
   const Lock held(_mutex);
-  if (!_storebagServerURL) _storebagServerURL = std::move(found);
+  if (!_storebagServerURL && found) {
+    _fromDeployment = fromDeployment;
+    _storebagServerURL = std::move(found);
+  }
   return _storebagServerURL;
 }
 
-std::optional<std::string> ProcessSettings::computeStorebagServerURL() {
-  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
-  if (!preference) return std::nullopt;
-  if (const auto url = preference.value() ? preference.value()->toText() : std::nullopt) return url;
+void ProcessSettings::readDeploymentAgain() {
+  using Kind = platform::LocalContent::Kind;
+  std::shared_ptr<const platform::LocalContent> broken;
+  {
+    const Lock held(_mutex);
+    if (!_fromDeployment) return;
+    _deployment.readAgain();
+    const auto now = _deployment.content();
+    if (!now) return;
+    if (now.value()->kind == Kind::broken) {
+      broken = now.value();
+    } else {
+      _storebagServerURL.reset();
+    }
+  }
+  if (broken) {
+    logWarning("storebagServerURL: %s; the address stays as it is", broken->error.c_str());
+  } else {
+    static_cast<void>(storebagServerURL());
+  }
+}
+
+std::optional<std::string> ProcessSettings::deployedStorebagServerURL() {
   const std::optional<bool> internal = _device.internalBuild();
   const auto host = internal ? storebagHost(*internal) : std::nullopt;
   if (!host) return std::nullopt;
@@ -104,13 +114,28 @@ std::optional<std::string> ProcessSettings::computeStorebagServerURL() {
 std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   const char* builtIn = internalBuild ? kInternalStorebagHost : kPublicStorebagHost;
   const char* key = internalBuild ? "internalStorebagHost" : "publicStorebagHost";
-  const std::optional<Dictionary> deployment = readDeployment(_files, _deploymentPath);
-  if (!deployment) return std::nullopt;
-  const std::string* host = deployment->string(key);
+  std::shared_ptr<const platform::LocalContent> deployment;
+  {
+    const Lock held(_mutex);
+    auto now = _deployment.content();
+    if (!now) return std::nullopt;
+    deployment = std::move(now).value();
+  }
+  if (deployment->warning) logWarning("storebagServerURL: %s", deployment->warning->c_str());
+  using Kind = platform::LocalContent::Kind;
+  if (deployment->kind == Kind::absent) return builtIn;
+  const Dictionary* hosts = deployment->kind == Kind::good ? deployment->value.asDictionary() : nullptr;
+  if (hosts == nullptr) {
+    logWarning("storebagServerURL: %s; using the built-in hosts",
+               deployment->kind == Kind::broken ? deployment->error.c_str()
+                                                : (deployment->placeOf({}) + ": not a dictionary").c_str());
+    return builtIn;
+  }
+  const std::string* host = hosts->string(key);
   if (host == nullptr) return builtIn;
   if (!looksLikeHost(*host)) {
-    logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s", _deploymentPath.c_str(),
-               key, host->c_str(), builtIn);
+    logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s",
+               deployment->placeOf({key}).c_str(), key, host->c_str(), builtIn);
     return builtIn;
   }
   return *host;

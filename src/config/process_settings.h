@@ -6,6 +6,7 @@
 #include <string>
 
 #include "base/mutex.h"
+#include "platform/local_settings.h"
 
 namespace veltrad::platform {
 class FileStore;
@@ -25,15 +26,17 @@ constexpr std::uint32_t kSeedEnvironment = 3;  // of ProcessSettings::currentEnv
 // must outlive it.
 class ProcessSettings {
  public:
-  // `deploymentPath` is a property list with the texts "internalStorebagHost" and "publicStorebagHost", each
-  // a host name with an optional port. Built-in hosts replace missing ones.
+  // `deploymentPath`: of either form; the file holds the texts "internalStorebagHost" and
+  // "publicStorebagHost", each a host name with an optional port; example hosts stand in for what is missing.
   ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
-                  platform::FileStore& files, std::string deploymentPath);
+                  platform::FileStore& files, const std::string& deploymentPath);
 
   // 0 to 4; 0 names no section of a storebag.
   std::optional<std::uint32_t> currentEnvironment();
   // Without a slash at the end, unless the preference has one.
   std::optional<std::string> storebagServerURL();
+  // Reads the deployment file again, if the address comes from there; for a broken file it stays as it is.
+  void readDeploymentAgain();
 
  private:
   // The type, and the invalid one that it replaces.
@@ -42,18 +45,18 @@ class ProcessSettings {
     std::optional<std::uint32_t> refused;
   };
   std::optional<Environment> userDefaultsEnvironment();
-  std::optional<std::string> computeStorebagServerURL();
+  std::optional<std::string> deployedStorebagServerURL();
   std::optional<std::string> storebagHost(bool internalBuild);
 
   // Constant after construction.
   platform::Preferences& _preferences;
   support::DeviceIdentity& _device;
-  platform::FileStore& _files;
-  const std::string _deploymentPath;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<std::uint32_t> _environment GUARDED_BY(_mutex);
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
+  bool _fromDeployment GUARDED_BY(_mutex) = false;  // there was no preference at the first call
+  platform::LocalSettings _deployment GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::config

@@ -112,9 +112,9 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
   }
   const std::string url = *server + "/" + name + "?version=" + version.value();
   logDebug("fetchStorebagWithName: Storebag Server URL: %s", url.c_str());
-  const http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
+  http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
   if (!result) return without(url, result.error());
-  const http::HTTPResponse& response = result.value();
+  http::HTTPResponse& response = result.value();
   answer.maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   answer.lastModified = lastModified;
   if (isNotModified(response, answer.lastModified)) {
@@ -126,6 +126,7 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
   if (!storebag) return answer;
   answer.kind = StorebagAnswer::Kind::fetched;
   answer.storebag = std::move(storebag).value();
+  answer.container = std::move(response.body);
   return answer;
 }
 
@@ -154,7 +155,7 @@ Result<Dictionary, StorebagDownload::Refusal> StorebagDownload::verifiedStorebag
   constexpr Failure<Refusal> kNotGenuine{Refusal::notGenuine};
   const auto container = parseStorebagContainer(body);
   if (!container)
-    logError("fetchStorebagWithName: propertyListWithData error %s", container.error().detail.c_str());
+    logError("fetchStorebagWithName: propertyListWithData error %s", container.error().description().c_str());
   if (!container || !container.value().signature) {
     logError("fetchStorebagWithName: Signature is missing");
     return kNotGenuine;

@@ -31,8 +31,8 @@ std::int32_t maxAgeOfCacheControl(std::optional<std::string_view> cacheControl);
 Dictionary defaultStorebag();
 
 struct WholeStorebagAnswer : StorebagAnswer {
-  // Verified; empty unless it was fetched.
-  Dictionary storebag;
+  Dictionary storebag;    // verified, where it was fetched
+  std::string container;  // its signed bytes; empty for a default storebag
 };
 
 // Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
@@ -45,12 +45,13 @@ class StorebagDownload {
   WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
                                             const std::optional<std::string>& lastModified);
 
- private:
   enum class Refusal { notGenuine, keyOutOfReach };
+  // The storebag in the bytes of a container, by the key of today. A refusal has been logged.
+  Result<Dictionary, Refusal> verifiedStorebag(std::string_view container) const;
 
+ private:
   WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
                                     const http::HTTPError& error) const;
-  Result<Dictionary, Refusal> verifiedStorebag(std::string_view body) const;
 
   http::HTTPClient& _http;
   ProcessSettings& _settings;

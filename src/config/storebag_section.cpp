@@ -2,10 +2,14 @@
 #include "config/storebag_section.h"
 
 #include <iterator>
+#include <utility>
 
 #include "config/client_types.h"
+#include "config/operator_settings.h"
 #include "config/process_settings.h"
 #include "config/storebag_content.h"
+#include "config/storebag_store.h"
+#include "platform/counters.h"
 #include "platform/log.h"
 
 namespace veltrad::config {
@@ -29,8 +33,13 @@ const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment)
 }  // namespace
 
 StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
-                                   const support::Veltra& veltra)
-    : _settings(settings), _download(http, settings, veltra) {}
+                                   const support::Veltra& veltra, OperatorSettings& choices,
+                                   StorebagStore& store, platform::Counters& counters)
+    : _settings(settings),
+      _download(http, settings, veltra),
+      _choices(choices),
+      _store(store),
+      _counters(counters) {}
 
 StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType(
     std::int32_t clientType, const std::optional<std::string>& lastModified) {
@@ -41,11 +50,23 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
              clientType);
     return {};
   }
-  const WholeStorebagAnswer whole = _download.fetchStorebagWithName(name, lastModified);
+  const auto choices = _choices.current();
+  if (!choices) {
+    refuse(clientType);
+    StorebagSectionAnswer none;
+    none.attempted = false;
+    return none;
+  }
+  const bool persist = choices->storebags.persist;
+  // What is to be kept must come whole once.
+  const bool conditional = !persist || _store.holds(name);
+  WholeStorebagAnswer whole =
+      _download.fetchStorebagWithName(name, conditional ? lastModified : std::nullopt);
   StorebagSectionAnswer answer{whole, nullptr, {}};
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
              clientType);
+  if (persist && answer.kind == Kind::notModified) _store.renew(name, answer.maxAge);
   if (answer.kind != Kind::fetched) return answer;
   answer.kind = Kind::failed;
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
@@ -70,7 +91,48 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     answer.maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
     logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
   }
+  if (persist && !whole.container.empty())
+    _store.write(name, {std::move(whole.container), answer.lastModified, answer.maxAge});
   return answer;
+}
+
+KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
+  KeptSection kept;
+  const char* name = storebagNameForClientType(clientType);
+  const auto choices = _choices.current();
+  if (name == nullptr || !choices || !choices->storebags.persist) return kept;
+  auto stored = _store.read(name);
+  if (!stored) return kept;
+  kept.known = !stored.value();
+  if (kept.known) return kept;
+  const auto whole = _download.verifiedStorebag(stored.value()->container);
+  if (!whole) {
+    kept.known = whole.error() != StorebagDownload::Refusal::keyOutOfReach;
+    if (kept.known) _store.remove(name, "its signature cannot be verified");
+    return kept;
+  }
+  const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
+  if (!environment) return kept;
+  kept.known = true;
+  const auto storebag = parsed<Storebag>(whole.value());
+  const Dictionary* section = sectionOf(storebag, *environment);
+  if (section == nullptr) return kept;
+  kept.answer.kind = StorebagAnswer::Kind::fetched;
+  kept.answer.section = parseSection(*section);
+  kept.answer.version = storebag.version;
+  kept.answer.maxAge = stored.value()->maxAge;
+  kept.answer.lastModified = std::move(stored.value()->lastModified);
+  kept.fetchTime = stored.value()->fetchTime;
+  return kept;
+}
+
+// Clients can cause it at will.
+void StorebagSections::refuse(std::int32_t clientType) {
+  _counters.count(wire::Reason::settings_broken);
+  const auto line = _refusals.happened(
+      "fetchStorebagForEnvironmentAndClientType: No storebag is accepted for client type " +
+      std::to_string(clientType) + " until the settings can be read");
+  if (line) logError("%s", line->c_str());
 }
 
 }  // namespace veltrad::config

@@ -3,21 +3,38 @@
 
 #include "config/storebag_download.h"
 #include "config/storebag_source.h"
+#include "platform/limited_line.h"
+
+namespace veltrad::platform {
+class Counters;
+}  // namespace veltrad::platform
 
 namespace veltrad::config {
 
-// Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
-// it.
+class OperatorSettings;
+class StorebagStore;
+
+// The real source: downloads the storebag at each call, and keeps it on disk where the operator has chosen
+// so. While the operator's choices cannot be read and never could, there is no attempt. Any number of threads
+// at once, one for each storebag. What the constructor takes must outlive it.
 class StorebagSections final : public StorebagSource {
  public:
-  StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
+  StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra,
+                   OperatorSettings& choices, StorebagStore& store, platform::Counters& counters);
 
   StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) override;
+  KeptSection keptStorebag(std::int32_t clientType) override;
 
  private:
+  void refuse(std::int32_t clientType);
+
   ProcessSettings& _settings;
   StorebagDownload _download;
+  OperatorSettings& _choices;
+  StorebagStore& _store;
+  platform::Counters& _counters;
+  platform::LimitedLine _refusals{"storebags"};
 };
 
 }  // namespace veltrad::config

@@ -30,6 +30,13 @@ struct StorebagSectionAnswer : StorebagAnswer {
   std::optional<std::string> version;
 };
 
+// What an earlier daemon has kept of a storebag.
+struct KeptSection {
+  bool known = false;  // false: not asked to keep any, or nobody can say just now
+  StorebagSectionAnswer answer;
+  double fetchTime = 0;  // of the answer, seconds since 1970
+};
+
 class StorebagSource {
  public:
   virtual ~StorebagSource() = default;
@@ -38,6 +45,8 @@ class StorebagSource {
   // the caller's copy. May block for a request to the server.
   virtual StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) = 0;
+  // What is kept of the client type's storebag, verified again; it has a section, or nothing is there to use.
+  virtual KeptSection keptStorebag(std::int32_t) { return {}; }
 };
 
 }  // namespace veltrad::config

@@ -4,16 +4,28 @@
 namespace veltrad::daemon {
 
 Daemon::Daemon(Services& services)
-    : _library(services.files, services.preferences, services.root),
+    : _services(services),
+      _library(services.files, services.preferences, services.root),
       _device(services.device),
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
+      _choices(services.files, services.root.settingsPath()),
+      _secret(services.files, services.root.secretPath()),
+      _sampling(_choices, _secret),
       _messageLog(services.clock, services.root.messageLogDirectory(), services.writer, services.counters),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _device, _library,
-                services.pool, services.lentFiles, services.root.preferencesDirectory()}),
-      _storebags(services.http, _settings, _library),
+                services.pool, services.lentFiles, services.root.preferencesDirectory(), &_sampling}),
+      _storebagStore(services.files, services.clock, services.root.storebagsDirectory()),
+      _storebags(services.http, _settings, _library, _choices, _storebagStore, services.counters),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
               services.counters, _flushes, _messageLog},
              _storebags, services.transaction) {}
+
+void Daemon::readConfigurationAgain() {
+  _services.entitlements.readAgain();
+  _services.device.readAgain();
+  _settings.readDeploymentAgain();
+  _choices.readAgain();
+}
 
 }  // namespace veltrad::daemon

@@ -2,10 +2,14 @@
 #pragma once
 
 #include "backends/backend_factory.h"
+#include "backends/sampling_factors.h"
+#include "config/operator_settings.h"
 #include "config/process_settings.h"
 #include "config/storebag_section.h"
+#include "config/storebag_store.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
+#include "platform/device_secret.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
@@ -19,14 +23,21 @@ class Daemon {
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
+  // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
+  void readConfigurationAgain();
 
  private:
+  Services& _services;
   support::Veltra _library;
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
+  config::OperatorSettings _choices;
+  platform::DeviceSecret _secret;
+  backends::SamplingFactors _sampling;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;
   backends::BackendFactory _factory;
+  config::StorebagStore _storebagStore;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
 };

@@ -66,7 +66,8 @@ bool makeDirectories(const platform::Root& root) {
 
 // Called after the daemon has taken its lock, because another daemon may be writing the files before.
 void removeUnfinishedFiles(const platform::Root& root) {
-  for (const std::string& directory : {root.runDirectory(), root.preferencesDirectory()}) {
+  for (const std::string& directory :
+       {root.runDirectory(), root.stateDirectory(), root.preferencesDirectory(), root.storebagsDirectory()}) {
     const std::size_t removed = platform::removeUnfinishedFiles(directory);
     if (removed > 0) logInfo("main: %zu unfinished files removed from %s", removed, directory.c_str());
   }
@@ -100,19 +101,21 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::CountersFile& countersFile,
-           daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
+           platform::CountersFile& countersFile, daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+  daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  // Connections free memory on their own threads after their sessions have gone, so memory is returned
-  // several times.
+  // The last threads may still be ending.
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
-  loop.run(tick, [&] {
+  const auto onTick = [&] {
     countersFile.writeSoon();
     metricsFile.writeSoon();
-    const bool idle = agent.sessionCount() == 0 && services.http.underWay() == 0;
+    // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
+    const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
+                      services.memory.used() == 0 && services.http.underWay() == 0;
     // Detects sessions that came and went between two ticks.
     const std::uint64_t acceptedNow = agent.acceptedSessions();
     if (!idle || acceptedNow != accepted) {
@@ -120,9 +123,14 @@ void serve(daemon::Services& services, daemon::VeltradAgent& agent, platform::Co
       returns = kTicksToReturnMemory;
     } else if (returns > 0) {
       --returns;
+      daemon.backends().rest();
       platform::returnFreeMemory();
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
+  };
+  loop.run(tick, onTick, [&] {
+    logInfo("main: SIGHUP, configuration is read again");
+    daemon.readConfigurationAgain();
   });
 }
 
@@ -145,21 +153,20 @@ bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& co
   return stuck == 0 && written;
 }
 
-// The exit status, if the arguments ask for no service.
-std::optional<int> answerArguments(int count, char** arguments) {
-  if (count <= 1) return std::nullopt;
-  const std::string_view argument = arguments[1];
-  if (count == 2 && argument == "--version") {
-    fmt::print("veltrad {}\n", kVersion);
-    return 0;
+// Prints what one of the two known arguments asks for. False: there is none, and others are not read.
+bool answerArguments(int count, char** arguments) {
+  for (int i = 1; i < count; ++i) {
+    const std::string_view argument = arguments[i];
+    if (argument == "--version") {
+      fmt::print("veltrad {}\n", kVersion);
+      return true;
+    }
+    if (argument == "--help") {
+      fmt::print("{}", kHelp);
+      return true;
+    }
   }
-  if (count == 2 && argument == "--help") {
-    fmt::print("{}", kHelp);
-    return 0;
-  }
-  fmt::print(stderr, "veltrad: unexpected argument \"{}\": expected --version, --help, or none\n",
-             arguments[count == 2 ? 1 : 2]);
-  return 2;
+  return false;
 }
 
 }  // namespace
@@ -169,7 +176,7 @@ int main(int count, char** arguments) {
   platform::keepEnvironment({"VELTRA_ROOT", "VELTRA_LOG", "VELTRA_LOG_TARGET", "VELTRA_SANDBOX", "LC_ALL",
                              "LC_MESSAGES", "LANG", "TZ", "NOTIFY_SOCKET", "LISTEN_PID", "LISTEN_FDS",
                              "LISTEN_FDNAMES", "WATCHDOG_PID", "WATCHDOG_USEC", "JOURNAL_STREAM"});
-  if (const auto status = answerArguments(count, arguments)) return *status;
+  if (answerArguments(count, arguments)) return 0;
   platform::takeUtilitySchedulingClass();
   platform::shareHeaps();
   platform::VeltraLogging::startLogging("veltrad", "Daemon");
@@ -205,7 +212,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon.agent(), countersFile, metricsFile, loop);
+  serve(services, daemon, listener, countersFile, metricsFile, loop);
 
   const bool ended = stop(services, listener, control, countersFile);
   daemon.backends().sayRest();

@@ -19,6 +19,7 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
 std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
   std::optional<std::string> lastModified;
+  if (name) recall(clientType, name);
   if (name) {
     const Lock held(_lock);
     StorebagRecord& record = settledRecord(name);
@@ -56,6 +57,36 @@ std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clie
   const Lock held(_lock);
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
   return at == _cachedStorebags.end() ? std::nullopt : at->second.version;
+}
+
+void StorebagCache::recall(std::int32_t clientType, const std::string& name) {
+  {
+    const Lock held(_lock);
+    StorebagRecord& record = settledRecord(name);
+    if (record.attempted || record.recalled) return;
+    record.beingFetched = true;
+  }
+  config::KeptSection kept;
+  try {
+    kept = _source.keptStorebag(clientType);
+  } catch (const std::bad_alloc&) {
+    const Lock held(_lock);
+    settle(_cachedStorebags[name]);
+    throw;
+  }
+  const Lock held(_lock);
+  StorebagRecord& record = _cachedStorebags[name];
+  settle(record);
+  record.recalled = kept.known;
+  if (!kept.answer.section) return;
+  logInfo("storebagForSession: Storebag '%s' is the one that was kept before the start", name.c_str());
+  record.data = std::move(kept.answer.section);
+  record.version = std::move(kept.answer.version);
+  record.fetchTime = kept.fetchTime;
+  record.fetchSuccessful = true;
+  record.maxAge = kept.answer.maxAge;
+  record.lastModified = std::move(kept.answer.lastModified);
+  record.attempted = true;
 }
 
 std::map<std::string, StorebagRecord> StorebagCache::records() {

@@ -27,6 +27,8 @@ struct StorebagRecord {
   std::optional<std::string> lastModified;
   // A first attempt has ended.
   bool attempted = false;
+  // What an earlier daemon has kept was looked at.
+  bool recalled = false;
   // Requests for this name wait.
   bool beingFetched = false;
 };
@@ -51,6 +53,8 @@ class StorebagCache {
   std::map<std::string, StorebagRecord> records();
 
  private:
+  // Called at the first use of a name: takes over what an earlier daemon has kept of it.
+  void recall(std::int32_t clientType, const std::string& name);
   // Called when the fetch of a record has ended.
   void settle(StorebagRecord& record) REQUIRES(_lock);
   // Waits until the record of this name is not being fetched.

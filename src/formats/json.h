@@ -1,8 +1,10 @@
 // Reads and writes values as JSON (RFC 8259).
 #pragma once
 
+#include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/result.h"
 #include "base/value.h"
@@ -20,6 +22,11 @@ struct JSONError {
 // 1970} a date, and {"$data": "base64"} data. Entries whose value is null are left out; elsewhere null is an
 // error. At most 64 levels deep; of equal keys the last one counts.
 Result<Value, JSONError> parseJSON(std::string_view text);
+// The same where "// …" and "/* … */" may stand between the tokens.
+Result<Value, JSONError> parseJSONWithComments(std::string_view text);
+// Where in a text that parseJSONWithComments takes the key or the element of an array begins that `path`
+// leads to: keys, and numbers of elements from 0 in decimal. Nothing: it is not there.
+std::optional<std::size_t> offsetInJSON(std::string_view text, const std::vector<std::string>& path);
 
 enum class JSONStyle { compact, pretty };
 // The reverse of parseJSON. A real that is not finite becomes null, an invalid byte of a text U+FFFD. If

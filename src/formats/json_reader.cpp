@@ -119,11 +119,11 @@ class Handler {
   std::string _failure;
 };
 
-}  // namespace
+constexpr unsigned kStrict = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag |
+                             rapidjson::kParseNumbersAsStringsFlag;
 
-Result<Value, JSONError> parseJSON(std::string_view text) {
-  constexpr unsigned kFlags = rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag |
-                              rapidjson::kParseNumbersAsStringsFlag;
+template <unsigned kFlags>
+Result<Value, JSONError> parse(std::string_view text) {
   Handler handler;
   rapidjson::Reader reader;
   rapidjson::MemoryStream stream(text.data(), text.size());
@@ -138,6 +138,16 @@ Result<Value, JSONError> parseJSON(std::string_view text) {
     return Failure{JSONError{stream.Tell(), "more text after the value"}};
   }
   return std::move(*handler.takeValue());
+}
+
+}  // namespace
+
+Result<Value, JSONError> parseJSON(std::string_view text) {
+  return parse<kStrict>(text);
+}
+
+Result<Value, JSONError> parseJSONWithComments(std::string_view text) {
+  return parse<kStrict | rapidjson::kParseCommentsFlag>(text);
 }
 
 }  // namespace veltrad::formats

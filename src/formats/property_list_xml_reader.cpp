@@ -197,7 +197,9 @@ void Reader::setHandlers() {
 
 void Reader::fail(Kind kind, std::string_view what) {
   if (failed()) return;
-  _error = {kind, fmt::format("line {}: {}", XML_GetCurrentLineNumber(_parser.get()), what)};
+  const TextPlace place{XML_GetCurrentLineNumber(_parser.get()),
+                        XML_GetCurrentColumnNumber(_parser.get()) + 1};
+  _error = {kind, std::string(what), place};
   XML_StopParser(_parser.get(), XML_FALSE);
 }
 

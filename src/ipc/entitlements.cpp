@@ -4,8 +4,6 @@
 #include <algorithm>
 #include <utility>
 
-#include "formats/property_list.h"
-#include "platform/file_store.h"
 #include "platform/log.h"
 
 namespace veltrad::ipc {
@@ -54,47 +52,44 @@ std::optional<std::string> problemOf(const Value& value) {
   return std::nullopt;
 }
 
-}  // namespace
-
-// Log lines, written after the lock was released.
-struct Entitlements::Said {
+struct ReadRules {
+  Array rules;
   std::optional<std::string> error;
-  std::optional<std::string> shortage;
   std::vector<std::string> warnings;
 };
 
-Array Entitlements::readRules(Said& said) {
-  const auto bytes = _files.read(_path);
-  if (!bytes) {
-    const platform::FileFailure& failure = bytes.error();
-    if (failure.passes()) {
-      said.shortage = failure.description;
-    } else if (failure.kind != platform::FileFailure::Kind::notFound) {
-      said.error = failure.description;
-    }
-    return {};
-  }
-  const auto list = formats::parsePropertyList(bytes.value());
-  const Array* rules = list ? list.value().asArray() : nullptr;
+ReadRules rulesIn(const platform::LocalContent& content) {
+  using Kind = platform::LocalContent::Kind;
+  ReadRules read;
+  if (content.warning) read.warnings.push_back(*content.warning);
+  if (content.kind == Kind::absent) return read;
+  const Array* rules = content.kind == Kind::good ? content.value.asArray() : nullptr;
   if (!rules) {
-    said.error = _path + ": " + (list ? "the outermost value is not an array of rules" : list.error().detail);
-    return {};
+    read.error = content.kind == Kind::broken
+                     ? content.error
+                     : content.placeOf({}) + ": the outermost value is not an array of rules";
+    return read;
   }
+  read.rules = *rules;
   bool namesUnits = false;
   for (std::size_t i = 0; i < rules->size(); ++i) {
     const Value& rule = (*rules)[i];
     if (const auto problem = problemOf(rule)) {
-      said.warnings.push_back(_path + ": rule " + std::to_string(i) + " grants nothing: " + *problem);
+      const std::string number = std::to_string(i);
+      read.warnings.push_back(content.placeOf({number}) + ": rule " + number +
+                              " grants nothing: " + *problem);
     } else {
       namesUnits = namesUnits || rule.asDictionary()->contains("unit");
     }
   }
   if (namesUnits && !kernelTellsUnits()) {
-    said.warnings.push_back(_path +
+    read.warnings.push_back(content.path +
                             ": rules with \"unit\" never match, this kernel does not tell a peer's process");
   }
-  return *rules;
+  return read;
 }
+
+}  // namespace
 
 std::optional<Value> entitlementInRules(const Array& rules, std::string_view name, const Peer& peer) {
   for (const Value& value : rules) {
@@ -116,22 +111,37 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
   });
 }
 
-Entitlements::Entitlements(platform::FileStore& files, std::string path)
-    : _files(files), _path(std::move(path)) {}
+Entitlements::Entitlements(platform::FileStore& files, const std::string& path) : _file(files, path) {}
+
+// Log lines, written after the lock was released.
+struct Entitlements::Said {
+  std::optional<std::string> error;
+  std::optional<std::string> shortage;
+  std::vector<std::string> warnings;
+};
 
 void Entitlements::refresh(Said& said) {
-  // The stamp comes first, so that a file that changes while it is read is read again.
-  const auto stamp = _files.stamp(_path);
-  if (!stamp) {
-    said.shortage = stamp.error().description;
+  auto now = _file.content();
+  if (!now) {
+    said.shortage = now.error().description;
     return;
   }
-  if (_read && stamp.value() == _stamp) return;
-  Array rules = readRules(said);
-  if (said.shortage) return;
-  _rules = std::move(rules);
-  _stamp = stamp.value();
-  _read = true;
+  if (now.value() == _content) return;
+  _content = std::move(now).value();
+  ReadRules fresh = rulesIn(*_content);
+  _rules = std::move(fresh.rules);
+  said.error = std::move(fresh.error);
+  said.warnings = std::move(fresh.warnings);
+}
+
+void Entitlements::readAgain() {
+  Said said;
+  {
+    Lock lock(_mutex);
+    _file.readAgain();
+    refresh(said);
+  }
+  say(said);
 }
 
 std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {

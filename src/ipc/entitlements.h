@@ -1,7 +1,7 @@
-// Entitlements of peers by etc/veltrad/entitlements.plist, which is read again when it changes. Any thread.
+// Who may do what: etc/veltrad/entitlements.plist or .json, reread when it changed. Any thread.
 #pragma once
 
-#include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -10,35 +10,34 @@
 #include "base/value.h"
 #include "ipc/peer.h"
 #include "platform/limited_line.h"
-
-namespace veltrad::platform {
-class FileStore;
-}  // namespace veltrad::platform
+#include "platform/local_settings.h"
 
 namespace veltrad::ipc {
 
-// The file is an array of rules, {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}. A rule
-// matches if all of its conditions match and there is at least one. A missing, unreadable or malformed file
-// grants nothing; the latter two are one error line for each change. During a shortage the last rules apply.
+// The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
+// rule with more than one of the three matches when all of them match, one with none never. A missing or
+// unreadable file grants nothing; an unreadable or malformed one is one error line a change. A rule of a
+// wrong type grants nothing, and one warning a change says what was expected. For a shortage the last rules
+// stand, and the file is read again at the next question.
 class Entitlements {
  public:
-  Entitlements(platform::FileStore& files, std::string path);
-  // The value in the first rule that matches and names the entitlement. The caller checks that it is true.
+  // `path`: of either form.
+  Entitlements(platform::FileStore& files, const std::string& path);
+  // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
   // False if no rule can grant it to this user, whatever the groups and the unit of the process.
   bool mayHold(std::string_view name, unsigned uid);
+  // Reads the file now, whether it has changed or not.
+  void readAgain();
 
  private:
   struct Said;
-  Array readRules(Said& said);
   void refresh(Said& said) REQUIRES(_mutex);
   void say(const Said& said);
 
-  platform::FileStore& _files;
-  const std::string _path;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  std::optional<std::uint64_t> _stamp GUARDED_BY(_mutex);
-  bool _read GUARDED_BY(_mutex) = false;
+  platform::LocalSettings _file GUARDED_BY(_mutex);
+  std::shared_ptr<const platform::LocalContent> _content GUARDED_BY(_mutex);  // what the rules are from
   Array _rules GUARDED_BY(_mutex);
   platform::LimitedLine _shortages{"questions"};
 };

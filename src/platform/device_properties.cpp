@@ -1,7 +1,6 @@
-// Device properties from device.plist, else from the machine.
+// The configured list first, then the machine. Any thread; the machine's files are read at each question.
 #include "platform/device_properties.h"
 
-#include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 #include "platform/machine_facts.h"
@@ -24,8 +23,8 @@ std::optional<std::string> factOf(MachineFacts& machine, std::string_view key) {
 
 }  // namespace
 
-MachineProperties::MachineProperties(FileStore& files, std::string devicePropertyListPath)
-    : _files(files), _path(std::move(devicePropertyListPath)) {}
+MachineProperties::MachineProperties(FileStore& files, const std::string& devicePath)
+    : _files(files), _file(files, devicePath) {}
 
 DeviceProperty MachineProperties::value(std::string_view key) {
   const auto list = configured();
@@ -36,38 +35,40 @@ DeviceProperty MachineProperties::value(std::string_view key) {
   return text->empty() ? std::nullopt : std::optional(*text);
 }
 
+void MachineProperties::readAgain() {
+  {
+    const Lock lock(_mutex);
+    _file.readAgain();
+  }
+  static_cast<void>(configured());
+}
+
 Result<Dictionary, FileFailure> MachineProperties::configured() {
-  auto list = readList();
-  const Lock lock(_mutex);
-  if (list) _lastList = list.value();
-  if (!list && _lastList) return *_lastList;
+  std::shared_ptr<const LocalContent> fresh;
+  Dictionary list;
+  {
+    const Lock lock(_mutex);
+    const auto now = _file.content();
+    if (!now && !_content) return Failure{now.error()};
+    if (now && now.value() != _content) {
+      fresh = _content = now.value();
+      const Dictionary* good =
+          fresh->kind == LocalContent::Kind::good ? fresh->value.asDictionary() : nullptr;
+      _list = good ? *good : Dictionary();
+    }
+    list = _list;
+  }
+  if (fresh) complain(*fresh);
   return list;
 }
 
-Result<Dictionary, FileFailure> MachineProperties::readList() {
-  const auto bytes = _files.read(_path);
-  if (!bytes) {
-    if (bytes.error().passes()) return Failure{bytes.error()};
-    if (bytes.error().kind != FileFailure::Kind::notFound) complainOnce(bytes.error().description);
-    return Dictionary();
-  }
-  const auto list = formats::parsePropertyList(bytes.value());
-  const Dictionary* dictionary = list ? list.value().asDictionary() : nullptr;
-  if (dictionary) return *dictionary;
-  complainOnce(_path + ": " +
-               (list ? "the outermost value is not a dictionary of texts" : list.error().detail));
-  return Dictionary();
-}
-
-void MachineProperties::complainOnce(const std::string& why) {
-  const auto stamp = _files.stamp(_path);
-  if (!stamp) return;  // the next call logs it
-  {
-    const Lock lock(_mutex);
-    if (_hasComplained && _complained == stamp.value()) return;
-    _hasComplained = true;
-    _complained = stamp.value();
-  }
+void MachineProperties::complain(const LocalContent& content) {
+  if (content.warning) logWarning("Device properties: %s", content.warning->c_str());
+  if (content.kind == LocalContent::Kind::absent) return;
+  const bool good = content.kind == LocalContent::Kind::good;
+  if (good && content.value.asDictionary()) return;
+  const std::string why =
+      good ? content.placeOf({}) + ": the outermost value is not a dictionary of texts" : content.error;
   logError("Device properties could not be read, the machine is asked: %s", why.c_str());
 }
 

@@ -1,8 +1,8 @@
 // The device property service: facts about this device by key. Any thread may ask.
 #pragma once
 
-#include <cstdint>
 #include <map>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -10,6 +10,7 @@
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/file_store.h"
+#include "platform/local_settings.h"
 
 namespace veltrad::platform {
 
@@ -25,31 +26,31 @@ class DeviceProperties {
   virtual DeviceProperty value(std::string_view key) = 0;
 };
 
-// Takes a property from device.plist (an empty text there means no value), else from the machine: os-release,
-// DMI or device tree, chassis. "UniqueDeviceID" is 40 hexadecimal digits derived one-way from the machine id.
-// The machine's files are the host's, not those under the root. An unreadable or malformed device.plist
-// counts as missing, with one error line for each change of the file. Files are read at each call; during a
-// shortage, the last content that was read is used.
+// device.plist or .json first (an empty text there: no value, and the machine is not asked), then what the
+// machine says: os-release, DMI or device tree, chassis. "UniqueDeviceID" is 40 hexadecimal digits derived
+// one-way from the machine id. The machine's files are always the host's, not under the root. An unreadable
+// or malformed one is one error line a change, and as if it were not there. The machine's files are read at
+// each question; what cannot be read for a shortage is as it was when it last could be.
 class MachineProperties final : public DeviceProperties {
  public:
-  MachineProperties(FileStore& files, std::string devicePropertyListPath);
+  // `devicePath`: of either form.
+  MachineProperties(FileStore& files, const std::string& devicePath);
   DeviceProperty value(std::string_view key) override;
+  // Reads the configured list now, whether it has changed or not.
+  void readAgain();
 
  private:
   DeviceProperty fromMachine(std::string_view key);
   Result<Dictionary, FileFailure> configured();
-  Result<Dictionary, FileFailure> readList();
-  void complainOnce(const std::string& why);
+  static void complain(const LocalContent& content);
 
   FileStore& _files;
-  const std::string _path;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  // The last content and facts read, for use during a shortage.
-  std::optional<Dictionary> _lastList GUARDED_BY(_mutex);
+  LocalSettings _file GUARDED_BY(_mutex);
+  // As last read; what stands in during a shortage.
+  std::shared_ptr<const LocalContent> _content GUARDED_BY(_mutex);  // null before the first reading
+  Dictionary _list GUARDED_BY(_mutex);
   std::map<std::string, std::optional<std::string>, std::less<>> _lastFacts GUARDED_BY(_mutex);
-  // The stamp of the file that the last error line was about.
-  FileStamp _complained GUARDED_BY(_mutex);
-  bool _hasComplained GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace veltrad::platform

@@ -127,6 +127,11 @@ Result<Done, FileFailure> DiskFileStore::rename(const std::string& from, const s
   return Done();
 }
 
+Result<Done, FileFailure> DiskFileStore::unlink(const std::string& path) {
+  if (::unlink(path.c_str()) != 0 && errno != ENOENT) return Failure{failureOf(path, errno)};
+  return Done();
+}
+
 Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
@@ -144,10 +149,10 @@ Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   return FileStamp(hash);
 }
 
-Result<Done, FileFailure> makeDirectories(const std::string& path) {
+Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode) {
   for (std::size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
-    if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) {
+    if (::mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
       const int error = errno;
       // An existing parent on a read-only or inaccessible file system is no error.
       struct stat status {};

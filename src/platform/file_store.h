@@ -33,8 +33,10 @@ class FileStore {
                                             unsigned mode = 0600) = 0;
   // Renames within one directory.
   virtual Result<Done, FileFailure> rename(const std::string& from, const std::string& to) = 0;
-  // A number that changes when the file is written or replaced; absent if there is no such file. Fails only
-  // for a shortage.
+  // Removes a file; one that is not there is removed already.
+  virtual Result<Done, FileFailure> unlink(const std::string& path) = 0;
+  // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
+  // alone.
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
 };
 
@@ -43,11 +45,12 @@ class DiskFileStore final : public FileStore {
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
   Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
   Result<Done, FileFailure> rename(const std::string& from, const std::string& to) override;
+  Result<Done, FileFailure> unlink(const std::string& path) override;
   Result<FileStamp, FileFailure> stamp(const std::string& path) override;
 };
 
-// Makes the directory and its parents (mode 0755) if they are missing.
-Result<Done, FileFailure> makeDirectories(const std::string& path);
+// Makes the directory and its parents where they are missing.
+Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode = 0755);
 
 // Removes the files that killed replace() calls left in the directory: NAME.XXXXXXXX.new with eight
 // hexadecimal digits. Returns how many. To be called before anything else writes there.

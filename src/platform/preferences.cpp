@@ -116,7 +116,7 @@ Result<Dictionary, FileFailure> FilePreferences::read(std::string_view domain, C
   const auto list = formats::parsePropertyList(bytes.value());
   const Dictionary* all = list ? list.value().asDictionary() : nullptr;
   if (all) return *all;
-  const std::string why = list ? "the outermost value is not a dictionary" : list.error().detail;
+  const std::string why = list ? "the outermost value is not a dictionary" : list.error().description();
   return refused(path, {FileFailure::Kind::other, path + ": " + why}, true, complaints);
 }
 

@@ -24,6 +24,10 @@ class Root {
   std::string controlSocketPath() const { return wire::controlSocketPathUnder(_directory); }
   std::string lockPath() const { return path("run/veltrad/lock"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
+  std::string stateDirectory() const { return path("var/lib/veltrad"); }
+  std::string secretPath() const { return path("var/lib/veltrad/secret"); }
+  // Storebags that survive a restart, a file a name.
+  std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }
   std::string metricsPath() const { return path("run/veltrad/metrics.prom"); }
   std::string preferencesDirectory() const { return path("var/lib/veltrad/preferences"); }
   std::string logsDirectory() const { return path("var/log/veltrad"); }
@@ -35,6 +39,7 @@ class Root {
   std::string entitlementsPath() const { return path("etc/veltrad/entitlements.plist"); }
   std::string devicePath() const { return path("etc/veltrad/device.plist"); }
   std::string deploymentPath() const { return path("etc/veltrad/deployment.plist"); }
+  std::string settingsPath() const { return path("etc/veltrad/settings.json"); }
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }

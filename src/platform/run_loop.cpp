@@ -37,14 +37,22 @@ void letASecondSignalEndTheProcess() {
   ::pthread_sigmask(SIG_UNBLOCK, &ending, nullptr);
 }
 
-// The signal that ends the loop, if it has arrived. SIGHUP is ignored: files are read again when they change.
-std::optional<int> endingSignal(int descriptor) {
+struct Signals {
+  std::optional<int> ending;
+  bool hangUp = false;
+};
+
+// Those that have come.
+Signals signalsIn(int descriptor) {
+  Signals come;
   signalfd_siginfo information{};
-  while (::read(descriptor, &information, sizeof information) == static_cast<ssize_t>(sizeof information)) {
+  while (!come.ending &&
+         ::read(descriptor, &information, sizeof information) == static_cast<ssize_t>(sizeof information)) {
     const int signal = static_cast<int>(information.ssi_signo);
-    if (signal == SIGTERM || signal == SIGINT) return signal;
+    if (signal == SIGHUP) come.hangUp = true;
+    if (signal == SIGTERM || signal == SIGINT) come.ending = signal;
   }
-  return std::nullopt;
+  return come;
 }
 
 }  // namespace
@@ -62,7 +70,8 @@ void RunLoop::blockSignals() {
   if (!_signals.isOpen()) std::abort();
 }
 
-int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>& tick) {
+int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>& tick,
+                 const std::function<void()>& hangUp) {
   using SteadyClock = std::chrono::steady_clock;
   auto next = SteadyClock::now() + interval;
   int signal = 0;
@@ -73,10 +82,12 @@ int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>
                              static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000)));
     if (ready < 0 && errno != EINTR) std::abort();
     if (ready > 0 && descriptors[0].revents != 0) {
-      if (const auto ending = endingSignal(_signals.get())) {
-        signal = *ending;
+      const Signals come = signalsIn(_signals.get());
+      if (come.ending) {
+        signal = *come.ending;
         break;
       }
+      if (come.hangUp) hangUp();
     }
     if (ready > 0 && descriptors[1].revents != 0) break;
     if (SteadyClock::now() < next) continue;

@@ -14,9 +14,11 @@ class RunLoop {
 
   // Blocks SIGTERM, SIGINT and SIGHUP, which then arrive through the loop, and ignores SIGPIPE and SIGXFSZ.
   void blockSignals();
-  // Calls `tick` every `interval` until SIGTERM, SIGINT or stop(). Returns the signal's number, or 0 after
-  // stop(). Another signal then ends the process at once with status 1.
-  int run(std::chrono::milliseconds interval, const std::function<void()>& tick);
+  // Calls `tick` every `interval`, and `hangUp` after SIGHUP, until SIGTERM, SIGINT or stop(). Returns the
+  // signal's number, 0 after stop(). After it has returned, a second signal ends the process at once with
+  // status 1.
+  int run(std::chrono::milliseconds interval, const std::function<void()>& tick,
+          const std::function<void()>& hangUp);
   // Any thread.
   void stop();
 

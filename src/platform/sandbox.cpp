@@ -97,7 +97,7 @@ SandboxProfile veltradSandboxProfile(const Root& root) {
        "/etc", "/proc", "/sys/class/dmi", "/sys/devices/virtual/dmi", "/sys/firmware/devicetree", "/usr/lib",
        "/usr/lib64", "/usr/local/lib", "/lib", "/lib64", "/usr/share/zoneinfo", "/usr/share/ca-certificates",
        "/usr/local/share/ca-certificates", "/run/systemd/resolve"},
-      {root.preferencesDirectory(), root.logsDirectory(), root.runDirectory(),
+      {root.stateDirectory(), root.logsDirectory(), root.runDirectory(),
        messageLog.substr(0, messageLog.rfind('/'))}};
 }
 

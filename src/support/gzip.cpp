@@ -46,6 +46,8 @@ const char* shown(const char* message) {
   return message != nullptr ? message : "(null)";
 }
 
+}  // namespace
+
 // A deflate stream.
 class Deflation {
  public:
@@ -66,6 +68,8 @@ class Deflation {
     }
     return _begun;
   }
+  // Makes a used stream as good as new.
+  bool beginAnew() { return deflateReset(&stream) == Z_OK; }
   void give(const char* bytes, std::size_t count) {
     stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes));  // zlib only reads them
     stream.avail_in = static_cast<uInt>(count);
@@ -86,6 +90,8 @@ class Deflation {
  private:
   bool _begun = false;
 };
+
+namespace {
 
 void sayEmpty() {
   logError("compressDataWithZlibOrGzip: Cannot compress empty Torvane");
@@ -135,9 +141,28 @@ bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
   return true;
 }
 
-std::optional<std::string> deflateAtOnce(std::string_view bytes) {
-  Deflation deflation;
-  if (!deflation.begin()) return std::nullopt;
+}  // namespace
+
+GzipCompressor::GzipCompressor() = default;
+GzipCompressor::~GzipCompressor() = default;
+
+void GzipCompressor::rest() {
+  std::unique_ptr<Deflation> kept;
+  const Lock held(_mutex);
+  kept.swap(_kept);
+}
+
+std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes) {
+  std::unique_ptr<Deflation> taken;
+  {
+    const Lock held(_mutex);
+    taken.swap(_kept);
+  }
+  if (!taken || !taken->beginAnew()) {
+    taken = std::make_unique<Deflation>();
+    if (!taken->begin()) return std::nullopt;
+  }
+  Deflation& deflation = *taken;
   deflation.give(bytes.data(), bytes.size());
   std::string output(deflateBound(&deflation.stream, bytes.size()), '\0');
   int result = deflation.run(Z_FINISH, output);
@@ -149,12 +174,12 @@ std::optional<std::string> deflateAtOnce(std::string_view bytes) {
   output.resize(deflation.stream.total_out);
   output.shrink_to_fit();  // it may wait for a server for a long time
   sayCompressed(bytes.size(), output.size());
+  const Lock held(_mutex);
+  _kept.swap(taken);
   return output;
 }
 
-}  // namespace
-
-std::optional<std::string> gzipDeflate(std::string_view bytes) {
+std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes) {
   if (bytes.empty()) {
     sayEmpty();
     return std::nullopt;

@@ -3,14 +3,35 @@
 
 #include <cstddef>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
+#include "base/mutex.h"
+
 namespace veltrad::support {
 
-// Absent if there are no bytes, memory is short or zlib fails.
-std::optional<std::string> gzipDeflate(std::string_view bytes);
+class Deflation;
+
+// Compresses texts. Keeps one stream of zlib (some 270 KB) between them, because memory that is taken from
+// the system and returned for each text costs dozens of page faults. Any thread.
+class GzipCompressor {
+ public:
+  GzipCompressor();
+  ~GzipCompressor();
+
+  // Absent if there are no bytes, memory is short or zlib fails.
+  std::optional<std::string> gzipDeflate(std::string_view bytes);
+  // Frees the stream until the next text.
+  void rest();
+
+ private:
+  std::optional<std::string> deflateAtOnce(std::string_view bytes);
+
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::unique_ptr<Deflation> _kept GUARDED_BY(_mutex);
+};
 
 // Writes the next bytes to `place`, at most `room`, and returns how many; 0 at the end. Absent after a
 // failure, which it logs.

@@ -168,7 +168,7 @@ std::optional<MessageLog::LogFile> MessageLog::newestSurvivor() {
 
 std::optional<MessageLog::LogFile> MessageLog::createFile() {
   LogFile file{fmt::format("{}/veltrad_{}_messageLog.diag", _directory, _clock.now().seconds), std::nullopt};
-  const int made = open(file.path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0644);
+  const int made = open(file.path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0640);
   if (made < 0) {
     logError("writeToLogFile: Failed to create new veltrad log file %s", file.path.c_str());
     return std::nullopt;

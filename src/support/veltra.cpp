@@ -33,7 +33,7 @@ Result<std::string, platform::FileFailure> Veltra::statedVersion() const {
   const auto list = formats::parsePropertyList(bytes.value());
   if (!list) {
     logWarning("The package manifest states no version: %s: %s", _manifestPath.c_str(),
-               list.error().detail.c_str());
+               list.error().description().c_str());
     return std::string(kVersion);
   }
   const Dictionary* manifest = list.value().asDictionary();

@@ -6,12 +6,15 @@
 #include <vector>
 
 #include "base/base64.h"
+#include "config/operator_settings.h"
 #include "config/process_settings.h"
+#include "config/storebag_store.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 #include "formats/property_list.h"
+#include "platform/counters.h"
 #include "platform/root.h"
 #include "rsa_key.h"
 #include "support/device_identity.h"
@@ -51,6 +54,10 @@ struct Configuration {
   FakeFileStore files;
   config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
   support::Veltra veltra{files, preferences, root};
+  FakeClock clock;
+  platform::Counters counters;
+  config::OperatorSettings choices{files, root.settingsPath()};
+  config::StorebagStore store{files, clock, root.storebagsDirectory()};
   http::HTTPResult answer =
       Failure{http::HTTPError{http::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
   FakeHTTPClient client{[this](http::HTTPRequest) { return answer; }};

@@ -41,7 +41,7 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
                 formats::writeXMLPropertyList(Array{}),
                 false,
                 publicURL,
-                ": not a dictionary; using the built-in hosts"},
+                ":1:1: not a dictionary; using the built-in hosts"},
                {{},
                 hosts("a/b"),
                 false,

@@ -125,7 +125,8 @@ struct Choice : config::StorebagSectionAnswer {
     Configuration configuration(environment);
     configuration.answers(container(formats::writeXMLPropertyList(storebag)),
                           {{"Cache-Control", cacheControl}});
-    config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra);
+    config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra,
+                                      configuration.choices, configuration.store, configuration.counters);
     StorebagSectionAnswer::operator=(sections.fetchStorebagForEnvironmentAndClientType(5, std::nullopt));
   }
 };

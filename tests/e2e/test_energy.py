@@ -37,7 +37,8 @@ class Energy(SystemTest):
             self.assertEqual(session.close(), 0)
 
         rules = (SOURCE / "packaging/veltrad.logrotate").read_text()
-        (self.root.path / "rules").write_text(rules.replace("/var/log/veltrad", str(self.directory)))
+        rules = rules.replace("/var/log/veltrad", str(self.directory)).replace("su veltrad veltrad", "")
+        (self.root.path / "rules").write_text(rules)
         (self.root.path / "rules").chmod(0o644)
         rotate = ["/usr/sbin/logrotate", "--force", "--state", str(self.root.path / "state"),
                   str(self.root.path / "rules")]

@@ -49,7 +49,8 @@ class Road(SystemTest):
     def test_examples(self):
         """The example clients in C and Python work."""
         with self.serving("user info provided without requiring it"):
-            for number, command in enumerate(([program("hello")], ["python3", str(SOURCE / "examples/hello.py")]), 1):
+            commands = [program("veltra-example-hello")], ["python3", str(SOURCE / "examples/hello.py")]
+            for number, command in enumerate(commands, 1):
                 done = subprocess.run(command, env=self.root.environment(), capture_output=True, timeout=30)
                 self.assertEqual(done.returncode, 0, (command, done.stderr.decode()))
                 wait_until(lambda: len([e for e in self.lab.events() if e["_method"] != 0]) >= number,

@@ -45,6 +45,12 @@ class FakeFileStore final : public platform::FileStore {
     _files.erase(from);
     return Done();
   }
+  Result<Done, platform::FileFailure> unlink(const std::string& path) override {
+    std::lock_guard lock(_mutex);
+    if (_writeFailure) return Failure{failureOf(path, *_writeFailure)};
+    _files.erase(path);
+    return Done();
+  }
   Result<platform::FileStamp, platform::FileFailure> stamp(const std::string& path) override {
     std::lock_guard lock(_mutex);
     if (_stampsFail) return Failure{failureOf(path, Kind::shortage)};

@@ -61,7 +61,8 @@ TEST(XMLPropertyList, refusesWhatIsNone) {
     const auto read = formats::parsePropertyList(list);
     ASSERT_FALSE(read.ok()) << list;
     EXPECT_EQ(read.error().kind, kind) << list << ": " << read.error().detail;
-    EXPECT_NE(read.error().detail.find(detail), std::string::npos) << list << ": " << read.error().detail;
+    EXPECT_NE(read.error().description().find(detail), std::string::npos)
+        << list << ": " << read.error().detail;
   };
   for (const char* other : {"", "{\"a\": 1}", "{ a = 1; }"})
     expectRefusal(other, Kind::notAPropertyList, "XML");

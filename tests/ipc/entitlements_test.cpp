@@ -97,6 +97,29 @@ TEST_F(EntitlementsTest, AFileThatCannotBeReadGrantsNothingAndIsOneLineAChange) 
   for (int i = 0; i < 2; ++i) EXPECT_FALSE(granted());
 }
 
+TEST_F(EntitlementsTest, ARuleOfAWrongTypeIsAWarningThatNamesItAndTheOthersHold) {
+  const char* const kGood = R"({"uid": 1000, "entitlements": {"com.florn.private.veltrad": true}})";
+  const std::pair<const char*, const char*> table[] = {
+      {"5", "expected a dictionary"},
+      {R"({"entitlements": {}})", "expected \"uid\", \"gid\" or \"unit\""},
+      {R"({"uid": "root", "entitlements": {}})", "\"uid\" is no user id, expected an integer"},
+      {R"({"gid": 1.5, "entitlements": {}})", "\"gid\" is no group id, expected an integer"},
+      {R"({"uid": 0, "unit": 7, "entitlements": {}})", "\"unit\" is no text, expected a unit's name"},
+      {R"({"uid": 0, "entitlements": ["x"]})", "expected a dictionary under \"entitlements\""}};
+  const std::string json = "/etc/veltrad/entitlements.json";
+  for (const auto& [rule, problem] : table) {
+    _files.put(json, std::string("[\n  // who may report\n  ") + kGood + ",\n  " + rule + "\n]");
+    _log.expectLine(platform::LogLevel::warning,
+                    "Entitlements: " + json + ":4:3: rule 1 grants nothing: " + problem);
+    for (int i = 0; i < 2; ++i) EXPECT_TRUE(granted()) << rule;
+  }
+  _files.put(json, "[");
+  _log.expectLine(platform::LogLevel::error,
+                  "Entitlements could not be read, nothing is granted: " + json + ":1:2: ");
+  EXPECT_FALSE(granted());
+  _entitlements.readAgain();
+}
+
 TEST_F(EntitlementsTest, TheLastRulesStandDuringAShortage) {
   put({rule({{"uid", 1'000}})});
   _log.expectLine(platform::LogLevel::warning,

@@ -76,6 +76,8 @@ TEST_F(MessageLogTest, KeepsTheYoungestFileOfADay) {
     expected.push_back(kept ? nameAt(_now - kept->age, kept->zeros) : nameAt(_now));
     EXPECT_THAT(_place.names(), ::testing::UnorderedElementsAreArray(expected));
     EXPECT_EQ(_place.read(expected.back()), (kept ? "old\n" : "") + _line);
+    const auto mode = std::filesystem::status(_place.path(expected.back())).permissions();
+    if (!kept) EXPECT_EQ(mode & std::filesystem::perms(0027), std::filesystem::perms::none);
   }
 }
 

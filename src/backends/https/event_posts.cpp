@@ -55,7 +55,7 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return;
   }
-  http::HTTPRequest request = makePostRequest(facts, *url, std::move(post.json), post.eventMap);
+  http::HTTPRequest request = makePostRequest(facts, *url, std::move(post.json), post.eventMap, _gzip);
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {

@@ -43,6 +43,8 @@ class EventPosts {
                   const VeltraBackend::FlushCompletion& completion);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
+  // Frees what is kept from post to post.
+  void rest() { _gzip.rest(); }
 
  private:
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
@@ -54,6 +56,7 @@ class EventPosts {
 
   // Shared, so that many sessions log no more lines than one.
   platform::LimitedLine _errorLine{"posts"};
+  support::GzipCompressor _gzip;
 };
 
 }  // namespace veltrad::backends

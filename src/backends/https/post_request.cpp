@@ -4,7 +4,6 @@
 #include <fmt/format.h>
 
 #include "backends/https/event.h"
-#include "support/gzip.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
@@ -16,14 +15,14 @@ std::string orNull(const std::optional<std::string>& text) {
 }  // namespace
 
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
-                                  std::optional<EventMap> eventMap) {
+                                  std::optional<EventMap> eventMap, support::GzipCompressor& gzip) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::event;
   request.url = std::move(url);
   request.keepsAnswer = false;
 
-  auto compressed = support::gzipDeflate(json);
+  auto compressed = gzip.gzipDeflate(json);
   const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
 

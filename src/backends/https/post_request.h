@@ -6,6 +6,7 @@
 #include <string>
 
 #include "http/http_client.h"
+#include "support/gzip.h"
 #include "wire/reasons.h"
 
 namespace veltrad::backends {
@@ -20,7 +21,7 @@ struct EventMap {
 
 // Compresses the JSON text if that makes it shorter. In "User-Agent", "(null)" stands for an absent text.
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
-                                  std::optional<EventMap> eventMap);
+                                  std::optional<EventMap> eventMap, support::GzipCompressor& gzip);
 
 // What an answer's status means for the back end and for the posted events.
 struct PostVerdict {

@@ -88,8 +88,10 @@ void addDaemon(std::string& out, const Dictionary& daemon) {
     if (!limit) continue;
     const double used = static_cast<double>(number(*limit, "used"));
     const double most = static_cast<double>(number(*limit, "limit"));
-    out += fmt::format("\n  {:<13} {} of {} ({:.0f} %)", text(*limit, "name", ""), number(*limit, "used"),
-                       number(*limit, "limit"), most > 0 ? 100 * used / most : 0);
+    const std::string name = text(*limit, "name", "");
+    const double unit = name == "memory" ? 1 << 20 : 1;
+    out += fmt::format("\n  {:<13} {:.0f} of {:.0f}{} ({:.0f} %)", name, used / unit, most / unit,
+                       unit > 1 ? " MiB" : "", most > 0 ? 100 * used / most : 0);
   }
 }
 

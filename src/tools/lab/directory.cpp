@@ -79,7 +79,7 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   }
   auto value = formats::parsePropertyList(bytes);
   if (value) return std::move(value).value();
-  return Failure{"no property list: " + value.error().detail};
+  return Failure{"no property list: " + value.error().description()};
 }
 
 Result<config::SigningKey, std::string> signingKeyIn(const std::string& directory) {

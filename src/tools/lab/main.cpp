@@ -8,6 +8,7 @@
 #include "directory.h"
 #include "formats/json.h"
 #include "options.h"
+#include "platform/service_manager.h"
 #include "server.h"
 
 namespace {
@@ -50,6 +51,7 @@ int serve(const Directory& directory, const Options& options) {
                                  {"pid", static_cast<long>(getpid())}};
   std::printf("%s\n", veltrad::formats::writeJSON(line).c_str());
   std::fflush(stdout);
+  veltrad::platform::ServiceManager().ready();
   int signal = 0;
   sigwait(&signals, &signal);
   server.stop();

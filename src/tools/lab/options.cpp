@@ -3,6 +3,8 @@
 
 #include <CLI/CLI.hpp>
 
+#include "base/version.h"
+
 namespace veltrad::lab {
 namespace {
 
@@ -35,6 +37,7 @@ drop, duplicate, reorder (send it after the next one), short, long, foreign (ano
 void describe(CLI::App& app, Options& options) {
   app.name("veltra-lab");
   app.description(kAbout);
+  app.set_version_flag("--version", std::string("veltra-lab ") + kVersion, "Print the version");
   app.add_option("--dir", options.path, "Directory for the certificate, keys, storebags and received data")
       ->type_name("DIR")
       ->capture_default_str();

@@ -31,6 +31,10 @@ const char* nameOf(KeyType type) {
       return "integer";
     case KeyType::real:
       return "number";
+    case KeyType::boolean:
+      return "boolean";
+    case KeyType::choice:
+      return "text";
     case KeyType::presence:
       return "any value";
     case KeyType::dictionary:
@@ -41,14 +45,21 @@ const char* nameOf(KeyType type) {
   return "";
 }
 
-std::string item(const Key& key) {
+// "drawn|stable" as a person says it.
+std::string choicesOf(const Key& key) {
+  std::string text = "\"";
+  for (const char c : std::string_view(key.choices)) text += c == '|' ? "\" or \"" : std::string(1, c);
+  return text + "\"";
+}
+
+std::string item(const Key& key, const char* unread) {
   const bool required = key.need == config::Need::required;
   std::string type = nameOf(key.type);
-  if (key.range.least < key.range.most)
-    type += fmt::format(", {:.0f} to {:.0f}", key.range.least, key.range.most);
-  return fmt::format("- **{}** ({}{}): {} Without it: {}\n", escaped(key.name), type,
+  if (key.range.least < key.range.most) type += fmt::format(", {} to {}", key.range.least, key.range.most);
+  if (key.choices) type = choicesOf(key);
+  return fmt::format("- **{}** ({}{}): {} Without it: {}{}\n", escaped(key.name), type,
                      required ? ", required" : "", sentence(escaped(key.meaning)),
-                     sentence(escaped(key.byDefault)));
+                     sentence(escaped(key.byDefault)), key.read == nullptr ? unread : "");
 }
 
 // A table, and the keys whose dictionaries have it.
@@ -67,14 +78,14 @@ std::string heading(const Level& level) {
 
 }  // namespace
 
-std::string keysOf(const KeyTable& table) {
+std::string keysOf(const KeyTable& table, const char* unread) {
   std::vector<Level> levels{{&table, {}}};
   std::string page;
   for (std::size_t i = 0; i < levels.size(); ++i) {
     if (i > 0) page += '\n' + heading(levels[i]);
     const KeyTable& keys = *levels[i].table;
     for (const Key& key : keys) {
-      page += item(key);
+      page += item(key, unread);
       if (key.inner == nullptr) continue;
       const auto same = [&key](const Level& level) { return level.table == key.inner; };
       auto level = std::find_if(levels.begin(), levels.end(), same);

@@ -7,6 +7,7 @@
 #include <iterator>
 #include <optional>
 
+#include "config/operator_settings.h"
 #include "config/storebag_content.h"
 #include "storebag/options.h"
 #include "tools/ctl/options.h"
@@ -24,6 +25,8 @@ constexpr std::string_view kBegin = "<!-- made: ";
 constexpr std::string_view kBeginEnd = " -->";
 constexpr std::string_view kEnd = "<!-- end -->";
 
+constexpr const char* kNotYet = " It is checked, but has no effect in this version; a warning says so.";
+
 struct Part {
   std::string_view name;
   std::string (*make)();
@@ -37,6 +40,7 @@ constexpr Part kParts[] = {
     {"description of veltra-lab", [] { return prose(lab::commandLine().about); }},
     {"options of veltra-lab", [] { return optionsOf(lab::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
+    {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},
     {"client types", clientTypes},
     {"environments", environments},
     {"reasons", reasons},

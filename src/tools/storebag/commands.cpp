@@ -73,7 +73,7 @@ Result<Bag, std::string> readBag(const std::string& path) {
   if (!list) {
     if (list.error().kind == PropertyListError::Kind::notAPropertyList)
       return Failure{path + ": neither a property list nor JSON"};
-    return Failure{path + ": " + list.error().detail};
+    return Failure{path + ": " + list.error().description()};
   }
   return Bag{std::move(list).value(), std::move(bytes).value()};
 }
@@ -148,7 +148,8 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
   const auto bytes = files.read(file, config::kStorebagMostContainerBytes);
   if (!bytes) return refused(bytes.error().description);
   const auto container = config::parseStorebagContainer(bytes.value());
-  if (!container) return refused(file + ": the container is no property list: " + container.error().detail);
+  if (!container)
+    return refused(file + ": the container is no property list: " + container.error().description());
   if (!container.value().signature) return refused(file + ": the text \"signature\" is missing");
   if (!container.value().bag) return refused(file + ": the text \"bag\" is missing");
   const std::optional<config::SignedStorebag> decoded = config::decodeStorebagContainer(container.value());

@@ -20,9 +20,10 @@ using config::KeyType;
 constexpr const char* kNobody = "refuses every client that requires user info";
 
 // In the order of KeyType.
-constexpr const char* kTypeNames[] = {"a text",   "a text",   "a text",       "an array of texts", "a number",
-                                      "a number", "anything", "a dictionary", "an array"};
-static_assert(std::size(kTypeNames) == static_cast<std::size_t>(KeyType::dictionaries) + 1);
+constexpr const char* kTypeNames[] = {"a text",   "a text",        "a text",   "an array of texts",
+                                      "a number", "a number",      "anything", "a dictionary",
+                                      "an array", "true or false", "a text"};
+static_assert(std::size(kTypeNames) == static_cast<std::size_t>(KeyType::choice) + 1);
 
 bool holdsText(const Array& array) {
   return std::any_of(array.begin(), array.end(), [](const Value& item) { return item.asString(); });

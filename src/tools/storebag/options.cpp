@@ -3,6 +3,8 @@
 
 #include <CLI/CLI.hpp>
 
+#include "base/version.h"
+
 namespace veltrad::storebag {
 
 using config::SigningKey;

@@ -48,8 +48,7 @@ TEST(Pages, NameEveryPathAndVariable) {
     const std::string text = contentOf(kSources / source);
     std::size_t found = 0;
     for (std::sregex_iterator match(text.begin(), text.end(), pattern), end; match != end; ++match, ++found)
-      EXPECT_NE(page.find("**" + (*match)[1].str() + "**"), std::string::npos)
-          << source << ": " << (*match)[1];
+      EXPECT_NE(page.find((*match)[1].str()), std::string::npos) << source << ": " << (*match)[1];
     EXPECT_GE(found, 2u) << source;
   }
 }

@@ -1,0 +1,64 @@
+# What cmake --install puts where, by component: daemon, library, development, tools, lab, python. Everything is relative to
+# the prefix, except that /usr has its configuration in /etc.
+include(CMakePackageConfigHelpers)
+
+set(UNIT_DIRECTORY lib/systemd/system)
+set(PYTHON_DIRECTORY lib/python3/dist-packages)
+set(CONFIG_DIRECTORY ${CMAKE_INSTALL_LIBDIR}/cmake/Veltra)
+set(MADE ${PROJECT_BINARY_DIR}/install)
+
+# veltra_install_unit(COMPONENT NAME): a unit, with the programs' place under the prefix.
+function(veltra_install_unit component name)
+  set(unit ${PROJECT_SOURCE_DIR}/packaging/${name})
+  set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${unit})
+  file(READ ${unit} text)
+  string(REPLACE "=/usr/libexec/" "=${CMAKE_INSTALL_FULL_LIBEXECDIR}/" text "${text}")
+  string(REPLACE "=/usr/bin/" "=${CMAKE_INSTALL_FULL_BINDIR}/" text "${text}")
+  file(CONFIGURE OUTPUT ${MADE}/${name} CONTENT "${text}" @ONLY)
+  install(FILES ${MADE}/${name} DESTINATION ${UNIT_DIRECTORY} COMPONENT ${component})
+endfunction()
+
+# veltra_install_configuration(COMPONENT FILE DIRECTORY NAME): a file below etc; the prefix is known at installation only.
+function(veltra_install_configuration component file directory name)
+  install(CODE "
+    if(CMAKE_INSTALL_PREFIX STREQUAL \"/usr\")
+      set(etc /etc)
+    else()
+      set(etc \${CMAKE_INSTALL_PREFIX}/etc)
+    endif()
+    file(INSTALL DESTINATION \${etc}/${directory} TYPE FILE RENAME ${name} FILES ${file})"
+    COMPONENT ${component})
+endfunction()
+
+# ---- The daemon ----
+install(TARGETS veltrad RUNTIME DESTINATION ${CMAKE_INSTALL_LIBEXECDIR} COMPONENT daemon)
+install(DIRECTORY DESTINATION ${CMAKE_INSTALL_DATADIR}/veltra COMPONENT daemon)  # the public key of storebags comes here
+veltra_install_unit(daemon veltrad.service)
+veltra_install_unit(daemon veltrad.socket)
+install(FILES packaging/veltrad.sysusers DESTINATION lib/sysusers.d RENAME veltrad.conf COMPONENT daemon)
+install(FILES packaging/veltrad.tmpfiles DESTINATION lib/tmpfiles.d RENAME veltrad.conf COMPONENT daemon)
+veltra_install_configuration(daemon ${PROJECT_SOURCE_DIR}/packaging/veltrad.logrotate logrotate.d veltrad)
+
+# ---- libveltra ----
+install(TARGETS veltra EXPORT Veltra
+        LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT library NAMELINK_COMPONENT development
+        INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(DIRECTORY include/veltra DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development)
+file(RELATIVE_PATH UP_TO_PREFIX ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_PREFIX})
+string(REGEX REPLACE "/$" "" UP_TO_PREFIX "${UP_TO_PREFIX}")
+configure_file(cmake/veltra.pc.in ${MADE}/veltra.pc @ONLY)
+install(FILES ${MADE}/veltra.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+configure_package_config_file(cmake/VeltraConfig.cmake.in ${MADE}/VeltraConfig.cmake
+                              INSTALL_DESTINATION ${CONFIG_DIRECTORY} NO_SET_AND_CHECK_MACRO)
+write_basic_package_version_file(${MADE}/VeltraConfigVersion.cmake COMPATIBILITY SameMajorVersion)
+install(FILES ${MADE}/VeltraConfig.cmake ${MADE}/VeltraConfigVersion.cmake DESTINATION ${CONFIG_DIRECTORY}
+        COMPONENT development)
+install(EXPORT Veltra FILE VeltraTargets.cmake NAMESPACE Veltra:: DESTINATION ${CONFIG_DIRECTORY} COMPONENT development)
+
+# ---- Tools, lab, Python ----
+install(TARGETS veltractl veltra-storebag RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)
+if(VELTRA_LAB)
+  install(TARGETS veltra-lab RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT lab)
+  veltra_install_unit(lab veltra-lab.service)
+endif()
+install(DIRECTORY python/veltra DESTINATION ${PYTHON_DIRECTORY} COMPONENT python PATTERN __pycache__ EXCLUDE)

@@ -1,0 +1,32 @@
+// The secret of this device, which nothing that leaves it reveals. Any thread.
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "base/mutex.h"
+#include "platform/file_store.h"
+
+namespace veltrad::platform {
+
+// 32 random bytes in a file of mode 0600, made at the first use. A file that cannot be written, or that is
+// not of that size and therefore not this one's, is one warning; then a secret serves that lasts as long as
+// this object.
+class DeviceSecret {
+ public:
+  static constexpr std::size_t kBytes = 32;
+
+  // The store outlives it.
+  DeviceSecret(FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
+
+  // Nothing: for a shortage nobody can say what is stored, so nothing was made.
+  std::optional<std::string> bytes();
+
+ private:
+  FileStore& _files;
+  const std::string _path;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::optional<std::string> _bytes GUARDED_BY(_mutex);
+};
+
+}  // namespace veltrad::platform
