@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -51,6 +52,28 @@ TEST(Pages, NameEveryPathAndVariable) {
       EXPECT_NE(page.find((*match)[1].str()), std::string::npos) << source << ": " << (*match)[1];
     EXPECT_GE(found, 2u) << source;
   }
+}
+
+// What bash offers for the last word. compopt works only while bash itself completes.
+std::string offered(const std::string& words) {
+  const std::string script = "compopt() { :; }; source packaging/completions/veltractl.bash; COMP_WORDS=(" +
+                             words +
+                             "); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); _veltractl; echo \"${COMPREPLY[*]}\"";
+  const std::string command = "cd '" + kSources.string() + "' && bash -c '" + script + "'";
+  std::FILE* output = popen(command.c_str(), "r");
+  char line[4096] = "";
+  if (std::fgets(line, sizeof line, output) == nullptr) ADD_FAILURE() << words;
+  pclose(output);
+  return line;
+}
+
+TEST(Completions, OfBash) {
+  const std::pair<const char*, const char*> cases[] = {
+      {"veltractl sta", "states status stats\n"}, {"veltractl --root send sta", "states status stats\n"},
+      {"veltractl send --cat", "--category\n"},   {"veltractl status --js", "--json\n"},
+      {"veltractl send --type \"\"", "\n"},       {"veltractl upload READ", "README.md\n"},
+      {"veltractl --root exam", "examples\n"}};
+  for (const auto& [words, expected] : cases) EXPECT_EQ(offered(words), expected) << words;
 }
 
 TEST(Pages, NameWhatCannotBeMade) {
