@@ -21,6 +21,7 @@ function(veltra_manual_pages component)
     set(filter ${PROJECT_SOURCE_DIR}/packaging/man.lua)
     add_custom_command(OUTPUT ${made} DEPENDS ${source} ${filter}
       COMMAND ${VELTRA_PANDOC} --from gfm --to man --standalone --shift-heading-level-by=-1 --lua-filter ${filter}
+              --metadata hyphenate=false --variable adjusting=l
               --metadata "footer=veltrad ${PROJECT_VERSION}" --output ${made} ${source}
       VERBATIM)
     set_property(GLOBAL APPEND PROPERTY VELTRA_MANUAL_PAGES ${made})

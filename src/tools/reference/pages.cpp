@@ -25,7 +25,7 @@ constexpr std::string_view kBegin = "<!-- made: ";
 constexpr std::string_view kBeginEnd = " -->";
 constexpr std::string_view kEnd = "<!-- end -->";
 
-constexpr const char* kNotYet = " It is checked, but has no effect in this version; a warning says so.";
+constexpr const char* kNotYet = " No effect in this version.";
 
 struct Part {
   std::string_view name;

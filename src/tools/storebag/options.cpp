@@ -12,6 +12,7 @@ using config::SigningKey;
 void describe(CLI::App& app, Arguments& given) {
   app.name("veltra-storebag");
   app.description("Create signing keys; sign, verify, show and check storebags.");
+  app.set_version_flag("--version", std::string("veltra-storebag ") + kVersion, "Print the version");
   app.require_subcommand(1);
   CLI::App* keygen =
       app.add_subcommand("keygen", "Create a signing key: DIR/privateKey.pem and DIR/publicKey.der");
