@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "base/value.h"
+#include "tools/command_line.h"
 
 namespace veltrad::ctl {
 
@@ -80,5 +81,8 @@ struct Ending {
 };
 
 std::variant<Options, Ending> parseOptions(int argc, const char* const* argv);
+
+// For the reference pages.
+tools::CommandLine commandLine();
 
 }  // namespace veltrad::ctl

@@ -1,0 +1,39 @@
+# bash completion for veltractl. Made from the program's own command line; do not change it by hand.
+_veltractl() {
+  local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} path="" words="" i
+  for ((i = 1; i < COMP_CWORD; i++)); do
+    case ${COMP_WORDS[i]} in
+      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag) ((i++)) ; continue ;;
+    esac
+    case $path+${COMP_WORDS[i]} in
+      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +stats) path+=/${COMP_WORDS[i]} ;;
+    esac
+  done
+  COMPREPLY=()
+  case $previous in
+    --input) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
+    --root) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- "$current"); return ;;
+    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag) return ;;
+  esac
+  case $path in
+    "/session") words=" --aggregate --input --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/send") words=" --category --type --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events --flag" ;;
+    "/one-shot") words=" --category --type --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/states") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/display-url") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/upload") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/upload-log-data") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
+    "/status") words=" --watch" ;;
+    "/metrics") words="" ;;
+    "/stats") words="" ;;
+    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics stats" ;;
+  esac
+  [[ $path == "" ]] || words+=" --root --json --version -h --help"
+  if [[ $current != -* ]]; then
+    case $path in
+      /upload | /upload-log-data) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
+    esac
+  fi
+  mapfile -t COMPREPLY < <(compgen -W "$words" -- "$current")
+}
+complete -F _veltractl veltractl

@@ -1,0 +1,41 @@
+// A command line as data, from which help pages and completions are made.
+#pragma once
+
+#include <string>
+#include <vector>
+
+namespace CLI {
+class App;
+}
+
+namespace veltrad::tools {
+
+struct Argument {
+  // "-o", "--output"; of a positional argument one name, as help shows it: "FILE".
+  std::vector<std::string> names;
+  // What follows an option: "DIR", "N". Empty: nothing.
+  std::string value;
+  // "0 - 65535"; empty: help says what is allowed.
+  std::string range;
+  // The heading under which help shows it; empty for the usual one.
+  std::string group;
+  std::string help;
+  std::string byDefault;
+  bool positional = false;
+  bool required = false;
+  bool repeated = false;
+};
+
+struct CommandLine {
+  std::string name;
+  std::string about;
+  std::string footer;
+  std::string group;
+  std::vector<Argument> arguments;
+  std::vector<CommandLine> commands;
+};
+
+// Without the help option of commands.
+CommandLine commandLineOf(const CLI::App& app);
+
+}  // namespace veltrad::tools

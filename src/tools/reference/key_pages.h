@@ -1,0 +1,20 @@
+// What the manual pages say about keys, client types and reasons.
+#pragma once
+
+#include <string>
+
+#include "config/key_table.h"
+
+namespace veltrad::reference {
+
+// The keys of the table and of all tables inside it, each of these under a heading of its own. `unread` is
+// added to the keys that the daemon does not read.
+std::string keysOf(const config::KeyTable& table, const char* unread = "");
+// A table of the client types: number, storebag and sender code.
+std::string clientTypes();
+// A table of the environments: number and section.
+std::string environments();
+// The texts that veltractl stats shows, with their names.
+std::string reasons();
+
+}  // namespace veltrad::reference

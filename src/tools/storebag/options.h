@@ -1,0 +1,25 @@
+// The command line of veltra-storebag.
+#pragma once
+
+#include <string>
+
+#include "config/storebag_signing.h"
+#include "storebag/commands.h"
+#include "tools/command_line.h"
+
+namespace veltrad::storebag {
+
+struct Arguments {
+  std::string directory, key, in, out, file;
+  int bits = config::SigningKey::kFewestBits;
+  bool json = false;
+  // Of the command, which runs while the arguments are parsed.
+  Outcome outcome;
+};
+
+void describe(CLI::App& app, Arguments& given);
+
+// For the reference pages.
+tools::CommandLine commandLine();
+
+}  // namespace veltrad::storebag
