@@ -133,7 +133,7 @@ class Doctor(SystemTest):
         https = f"https://localhost:{closed_port()}/bags"
         example, address = ("veltra_storebag_url", "deployment"), "storebagAddress"
         rows = [({}, None, address, (*example, "built-in example"), ON_THE_WAY),
-                ({}, b"<plist>", address, (*example, "deployment.plist: "), ON_THE_WAY),
+                ({}, b"<plist>", address, (*example, "deployment.plist:1:"), ON_THE_WAY),
                 ({}, {"publicStorebagHost": "a/b"}, address, (*example, "host name"), ON_THE_WAY),
                 ({"veltra_storebag_url": "https://storebags.example/bags/maple"}, None, address, example, ON_THE_WAY),
                 ({"veltra_storebag_url": https.replace("https", "http")}, None, address, ("https://",), ON_THE_WAY),
