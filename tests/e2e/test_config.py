@@ -209,7 +209,7 @@ class Report(SystemTest):
             for hidden in (secret, person, UUID, "cd" * 20, os.uname().nodename, "people.example", "01:23:45"):
                 self.assertNotIn(hidden, written)
             for shown in ("veltrad 8", "libcurl/", "Linux", "environmentType = 4", "collector.example/in", "bags.example",
-                          "12.1", "veltrad: started", "h.example/x", "nothing counted yet", "never"):
+                          "12.1", "veltrad: started", "h.example/x", "nothing counted yet", "no session has asked"):
                 self.assertIn(shown, written)
             self.assertEqual(report("-o", str(path), "--yes").returncode, 1)
             self.assertEqual(path.read_text(), written)
