@@ -7,7 +7,7 @@ import struct
 import subprocess
 import time
 
-from family import SET, Daemon, Lab, Root, Wire, cpu_seconds, storebag
+from family import SET, Daemon, Wire, cpu_seconds, lab_and_root, storebag
 from harness import program, wait_until
 
 SESSIONS, RATE, SECONDS, IDLE = 100, 10_000, 5, 1_000
@@ -43,9 +43,7 @@ def busy(root, pid):
 
 def main():
     figures = json.loads(subprocess.run([program("dashboard_bench")], capture_output=True, check=True).stdout)
-    root, lab = Root(), Lab()
-    try:
-        root.use(lab)
+    with lab_and_root() as (lab, root):
         lab.put("quindle", storebag(backends={"dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}",
                                                             "reliable": 500}}))
         daemon = Daemon(root, env={"VELTRA_LOG": "error"}, serving=False)
@@ -75,10 +73,6 @@ def main():
         for wire in idle:
             wire.close()
         daemon.kill()
-    finally:
-        lab.stop()
-        Lab.forget_keys()
-        root.remove()
 
 
 if __name__ == "__main__":

@@ -1,5 +1,6 @@
 """Measures the cost of families with the programs in VELTRA_BUILD (by default build/release): the daemon's CPU time for a
 message of a root, and of a child with and without an aggregating root, and the time of a refresh of 1,000 sessions."""
+import contextlib
 import json
 import os
 import pathlib
@@ -18,6 +19,17 @@ from harness import Daemon, Lab, Root, Wire, storebag  # noqa: E402
 MESSAGES, ROUNDS, FAMILY, REFRESHES = 100_000, 5, 1_000, 40
 ROOT, CHILD = 7, 6  # client types
 SET = "setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:"
+
+
+@contextlib.contextmanager
+def lab_and_root():
+    root, lab = Root(), Lab()
+    try:
+        root.use(lab)
+        yield lab, root
+    finally:
+        lab.stop()
+        root.remove()
 
 
 def cpu_seconds(pid):
@@ -76,9 +88,7 @@ def refresh_milliseconds(root, name):
 
 
 def main():
-    root, lab = Root(), Lab()
-    try:
-        root.use(lab)
+    with lab_and_root() as (lab, root):
         for kind, name, level in ((ROOT, "quindle", 0), (CHILD, "ostvane", 1)):
             # The back ends are sampled out, so nothing is posted.
             entry = {"client": "alone,lonely,family,thousand,elsewhere", "locale_whitelist": ["US"], "filters": [],
@@ -105,10 +115,6 @@ def main():
         for wire in (*members, *cases.values(), inside, quiet):
             wire.close()
         daemon.kill()
-    finally:
-        lab.stop()
-        Lab.forget_keys()
-        root.remove()
 
 
 if __name__ == "__main__":

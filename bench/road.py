@@ -7,7 +7,7 @@ import pathlib
 import subprocess
 import time
 
-from family import Daemon, Lab, Root
+from family import Daemon, lab_and_root
 from harness import program, wait_until
 
 SESSIONS = 100
@@ -53,9 +53,7 @@ def memory_of_sessions(root):
 def main():
     if os.environ.get("VELTRA_PIN"):
         os.sched_setaffinity(0, {0})
-    root, lab = Root(), Lab()
-    try:
-        root.use(lab)
+    with lab_and_root() as (lab, root):
         entry = {"post_url": lab.url + "/collect/events", "filters": [], "event_threshold": 1000}
         lab.put("ostvane", {"release": {"httppost": {"clients": [entry]}}, "version": "1"})
         daemon, ready = start_milliseconds(root)
@@ -68,10 +66,6 @@ def main():
         daemon.stop()
         figures.update(memory_of_sessions(root))
         print(json.dumps(figures, indent=2))
-    finally:
-        lab.stop()
-        Lab.forget_keys()
-        root.remove()
 
 
 main()

@@ -1,8 +1,11 @@
 """Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
 place; the exit status is 1 if there is any."""
+import collections
 import concurrent.futures
+import json
 import os
 import re
+import shlex
 import subprocess
 import sys
 from pathlib import Path
@@ -13,8 +16,9 @@ RUNGS = [line.split() for line in re.findall(r"^veltra_rung\((.*)\)$", (ROOT / "
 RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
 # Kinds of back ends, which must not include each other.
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
-LONGEST_BODY = 400
+LONGEST_BODY = 380
 LONGEST_HEADER = 300
+LARGEST_UNIT = 24
 
 
 def sources(*suffixes):
@@ -99,10 +103,38 @@ def body_for(header, bodies):
     return None
 
 
-def lint(body):
-    done = subprocess.run(["clang-tidy", "--quiet", "-p", "build/lint", str(body)], cwd=ROOT, capture_output=True, text=True)
-    found = [line for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
-    return found or ([] if done.returncode == 0 else [f"{body}: clang-tidy failed: {done.stderr.strip()}"])
+def lint_units(bodies):
+    """Divides the bodies of each folder of CMake into units of at most LARGEST_UNIT, largest first: pairs of the bodies and
+    the flags they are compiled with. A unit becomes one file, because most of clang-tidy's time goes into the headers."""
+    folders = collections.defaultdict(list)
+    for entry in json.loads((ROOT / "build/lint/compile_commands.json").read_text()):
+        if Path(entry["file"]) in bodies:
+            command, _, target = entry["command"].partition(" -o ")
+            folders[target.split("/CMakeFiles/")[0]].append((entry["file"], command.split(" ", 1)[1]))
+    units = []
+    for commands in folders.values():
+        commands.sort()
+        count = -(-len(commands) // LARGEST_UNIT)
+        units += [commands[len(commands) * i // count:len(commands) * (i + 1) // count] for i in range(count)]
+    units.sort(key=len, reverse=True)
+    return [([body for body, _ in unit], shlex.split(" ".join(dict.fromkeys(flags for _, flags in unit)))) for unit in units]
+
+
+def lint(unit):
+    bodies, flags = unit
+    lines, origin = [], []
+    for body in bodies:
+        text = Path(body).read_text().splitlines()
+        lines += text
+        origin += [f"{body}:{number}" for number in range(1, len(text) + 1)]
+    path = ROOT / "build/lint/units" / "_".join(Path(bodies[0]).relative_to(ROOT / "src").parts)
+    path.parent.mkdir(exist_ok=True)
+    path.write_text("\n".join(lines) + "\n")
+    folders = [word for folder in sorted({str(Path(body).parent) for body in bodies}) for word in ("-iquote", folder)]
+    done = subprocess.run(["clang-tidy", "--quiet", str(path), "--", *flags, *folders], cwd=ROOT, capture_output=True, text=True)
+    found = [re.sub(rf"^{re.escape(str(path))}:(\d+)", lambda place: origin[int(place[1]) - 1], line)
+             for line in done.stdout.splitlines() if re.search(r": (warning|error):", line)]
+    return found or ([] if done.returncode == 0 else [f"{bodies[0]}: clang-tidy failed: {done.stderr.strip()}"])
 
 
 def check_lint(changed=None):
@@ -114,7 +146,9 @@ def check_lint(changed=None):
         headers = {path for path in files if path.suffix in (".h", ".hpp") and path.exists()}
         bodies = bodies & (files | {body_for(path, bodies) for path in headers})
     with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
-        return sorted({line.replace(f"{ROOT}/", "") for found in pool.map(lint, sorted(bodies)) for line in found})
+        found = {line for lines in pool.map(lint, lint_units(bodies)) for line in lines}
+    # A room's header is included through the link to the room's folder.
+    return sorted({re.sub(r"^build/lint/rooms/\w+/", "src/", line.replace(f"{ROOT}/", "")) for line in found})
 
 
 def main():

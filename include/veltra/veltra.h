@@ -131,6 +131,7 @@ typedef struct veltra_session veltra_session;
 typedef void (*veltra_aggregation_callback)(void* context, const veltra_value* session_info, double timestamp,
                                             uint16_t category, uint16_t type, const veltra_value* payload);
 
+/* Its 17 fields are what the daemon is told about the session, and how the library serves it. */
 typedef struct veltra_session_options {
   size_t size;      /* sizeof(veltra_session_options), which identifies the version of the struct */
   const char* root; /* the directory that contains run/veltrad; NULL: VELTRA_ROOT, else "/" */

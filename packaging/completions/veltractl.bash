@@ -3,17 +3,17 @@ _veltractl() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} path="" words="" i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag) ((i++)) ; continue ;;
+      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | -o | --output) ((i++)) ; continue ;;
     esac
     case $path+${COMP_WORDS[i]} in
-      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +stats) path+=/${COMP_WORDS[i]} ;;
+      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats) path+=/${COMP_WORDS[i]} ;;
     esac
   done
   COMPREPLY=()
   case $previous in
-    --input) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
+    --input | -o | --output) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
     --root) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- "$current"); return ;;
-    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag) return ;;
+    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | -o | --output) return ;;
   esac
   case $path in
     "/session") words=" --aggregate --input --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
@@ -25,8 +25,15 @@ _veltractl() {
     "/upload-log-data") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
     "/status") words=" --watch" ;;
     "/metrics") words="" ;;
+    "/config/get") words="" ;;
+    "/config/set") words="" ;;
+    "/config/unset") words="" ;;
+    "/config") words=" get set unset" ;;
+    "/refresh") words="" ;;
+    "/report") words=" -o --output --yes" ;;
+    "/doctor") words=" --client-type" ;;
     "/stats") words="" ;;
-    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics stats" ;;
+    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics config refresh report doctor stats" ;;
   esac
   [[ $path == "" ]] || words+=" --root --json --version -h --help"
   if [[ $current != -* ]]; then

@@ -35,6 +35,8 @@ std::optional<std::string> VeltraBackend::sendNumberedMessage(const NumberedMess
   return std::nullopt;
 }
 
+// Back ends that override it keep the completion, hence by value.
+// NOLINTNEXTLINE(performance-unnecessary-value-param)
 std::optional<std::string> VeltraBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (completion) completion(std::nullopt, std::nullopt);
   return std::nullopt;

@@ -1,9 +1,12 @@
-// The constants of the binary property list format, for its reader and its writer.
+// The binary property list format: its constants, and its trailer.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
 #include <string_view>
+
+#include "base/property_list.h"
+#include "base/result.h"
 
 namespace veltrad::binary_property_list {
 
@@ -28,5 +31,26 @@ inline constexpr std::uint8_t kSet = 0xC0;
 inline constexpr std::uint8_t kDictionary = 0xD0;
 
 inline constexpr double kSecondsFrom1970To2001 = 978'307'200;
+
+// `size` is 1 to 8.
+inline std::uint64_t bigEndian(const char* at, std::size_t size) {
+  std::uint64_t number = static_cast<std::uint8_t>(at[0]);
+  for (std::size_t i = 1; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
+  return number;
+}
+
+struct Trailer {
+  // Bytes of an offset in the table, and of a reference to an object: 1 to 8.
+  std::size_t offsetSize = 0;
+  std::size_t referenceSize = 0;
+  // Objects in the list, and the number of the outermost one.
+  std::uint64_t count = 0;
+  std::uint64_t top = 0;
+  // Where the table of offsets begins, which ends the objects.
+  std::uint64_t table = 0;
+};
+
+// `bytes` begin with the header. The table lies within them.
+Result<Trailer, PropertyListError> parseTrailer(std::string_view bytes);
 
 }  // namespace veltrad::binary_property_list

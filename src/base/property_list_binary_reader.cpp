@@ -20,13 +20,6 @@ namespace {
 using namespace binary_property_list;
 using Kind = PropertyListError::Kind;
 
-// `size` is 1 to 8.
-std::uint64_t bigEndian(const char* at, std::size_t size) {
-  std::uint64_t number = static_cast<std::uint8_t>(at[0]);
-  for (std::size_t i = 1; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
-  return number;
-}
-
 // The memory of a string that was allocated with this length; a short one is stored in the object itself.
 std::size_t textBlock(std::size_t length) {
   static const std::size_t kInPlace = std::string().capacity();
@@ -44,9 +37,12 @@ class Reader {
         _depthLimit(limits.depth) {}
 
   Result<Value, PropertyListError> read() {
+    const auto trailer = parseTrailer(_bytes);
+    if (!trailer) return Failure{trailer.error()};
+    _trailer = trailer.value();
     Value value(false);
     Object top;
-    if (!readTrailer() || !charge(1) || !locate(_top, top) || !readObject(top, nullptr, 1, value)) {
+    if (!charge(1) || !locate(_trailer.top, top) || !readObject(top, nullptr, 1, value)) {
       return Failure{std::move(_error)};
     }
     return value;
@@ -83,7 +79,6 @@ class Reader {
                 fmt::format("object {}: offset {} lies outside the objects", number, offset));
   }
 
-  bool readTrailer();
   bool charge(std::uint64_t objects);
   bool chargeText(std::uint64_t bytes);
   bool chargeMemory(std::uint64_t bytes);
@@ -104,7 +99,7 @@ class Reader {
   bool readDictionary(Object& object, const Path* path, int depth, Value& value);
 
   std::uint64_t reference(std::string_view references, std::uint64_t i) const {
-    return bigEndian(references.data() + i * _referenceSize, _referenceSize);
+    return bigEndian(references.data() + i * _trailer.referenceSize, _trailer.referenceSize);
   }
 
   const std::string_view _bytes;
@@ -112,43 +107,9 @@ class Reader {
   std::uint64_t _textLeft;
   std::uint64_t _memoryLeft;
   const int _depthLimit;
-  std::size_t _offsetSize = 0;
-  std::size_t _referenceSize = 0;
-  std::uint64_t _count = 0;
-  std::uint64_t _top = 0;
-  std::uint64_t _table = 0;  // ends the object area
+  Trailer _trailer;
   PropertyListError _error{};
 };
-
-bool Reader::readTrailer() {
-  if (_bytes.size() < kHeader.size() + 1 + 1 + kTrailerSize) {
-    return fail(Kind::malformed, fmt::format("{} bytes are too few for a binary list", _bytes.size()));
-  }
-  const std::uint64_t end = _bytes.size() - kTrailerSize;
-  const char* trailer = _bytes.data() + end;
-  _offsetSize = static_cast<std::uint8_t>(trailer[6]);
-  _referenceSize = static_cast<std::uint8_t>(trailer[7]);
-  _count = bigEndian(trailer + 8, 8);
-  _top = bigEndian(trailer + 16, 8);
-  _table = bigEndian(trailer + 24, 8);
-  if (_offsetSize < 1 || _offsetSize > 8 || _referenceSize < 1 || _referenceSize > 8) {
-    return fail(Kind::malformed,
-                fmt::format("trailer: offsets of {} and references of {} bytes, 1 to 8 expected", _offsetSize,
-                            _referenceSize));
-  }
-  if (_table <= kHeader.size() || _table >= end) {
-    return fail(Kind::malformed,
-                fmt::format("trailer: the table at {} lies outside the {} bytes before it", _table, end));
-  }
-  if (_count == 0 || _count > (end - _table) / _offsetSize) {
-    return fail(Kind::malformed,
-                fmt::format("trailer: {} objects in a table of {} bytes", _count, end - _table));
-  }
-  if (_top >= _count) {
-    return fail(Kind::malformed, fmt::format("trailer: object {} is the top of {} objects", _top, _count));
-  }
-  return true;
-}
 
 bool Reader::charge(std::uint64_t objects) {
   if (objects > _objectsLeft) return fail(Kind::tooLarge, "more objects than the limit");
@@ -170,13 +131,14 @@ inline bool Reader::chargeMemory(std::uint64_t bytes) {
 }
 
 inline bool Reader::locate(std::uint64_t number, Object& object) {
-  if (number >= _count)
-    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _count));
-  const std::uint64_t offset = bigEndian(_bytes.data() + _table + number * _offsetSize, _offsetSize);
-  if (offset < kHeader.size() || offset >= _table) return badOffset(number, offset);
+  if (number >= _trailer.count)
+    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _trailer.count));
+  const std::uint64_t offset =
+      bigEndian(_bytes.data() + _trailer.table + number * _trailer.offsetSize, _trailer.offsetSize);
+  if (offset < kHeader.size() || offset >= _trailer.table) return badOffset(number, offset);
   object.number = number;
   object.marker = static_cast<std::uint8_t>(_bytes[offset]);
-  object.rest = std::string_view(_bytes.data() + offset + 1, _table - offset - 1);
+  object.rest = std::string_view(_bytes.data() + offset + 1, _trailer.table - offset - 1);
   return true;
 }
 
@@ -336,7 +298,7 @@ bool Reader::readArray(Object& object, const Path* path, int depth, Value& value
   std::string_view references;
   // The elements are charged before they are allocated.
   if (!enter(object, path, depth) || !takeCount(object, count) ||
-      !take(object, count, _referenceSize, references) || !charge(count) ||
+      !take(object, count, _trailer.referenceSize, references) || !charge(count) ||
       !chargeMemory(sharedBytes<Array>() + blockBytes(count * sizeof(Value)))) {
     return false;
   }
@@ -358,7 +320,7 @@ bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& 
   std::uint64_t count = 0;
   std::string_view references;
   if (!enter(object, path, depth) || !takeCount(object, count) ||
-      !take(object, count, 2 * _referenceSize, references) || !charge(2 * count) ||
+      !take(object, count, 2 * _trailer.referenceSize, references) || !charge(2 * count) ||
       !chargeMemory(sharedBytes<Dictionary>() + blockBytes(count * sizeof(Dictionary::Entry)))) {
     return false;
   }

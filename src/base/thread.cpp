@@ -62,7 +62,7 @@ bool Thread::start(const char* name, std::size_t stackBytes, std::function<void(
   _running = pthread_create(&_thread, &attributes, run, start.get()) == 0;
   pthread_sigmask(SIG_SETMASK, &before, nullptr);
   pthread_attr_destroy(&attributes);
-  if (_running) start.release();
+  if (_running) (void)start.release();  // The new thread owns it.
   return _running;
 }
 

@@ -21,13 +21,16 @@ using Entries = std::vector<Dictionary::Entry>;
 // The daemon's limit, less the levels of the frame's own dictionaries.
 constexpr int kDeepestArgument = wire::kMostFrameDepth - 4;
 
-bool absentOrDictionary(const veltra_value* value) {
-  return !value || value->entries();
+// False for a value that is too large for a call, which is then not even copied.
+bool fits(const veltra_value& value) {
+  return value.depth <= kDeepestArgument && value.objects <= wire::kMostCallObjects;
 }
 
-// False for a value that is too large for a call, which is then not even copied.
-bool fits(const veltra_value* value) {
-  return !value || (value->depth <= kDeepestArgument && value->objects <= wire::kMostCallObjects);
+// Whether a call can carry this dictionary, which may be null.
+veltra_status verdictOn(const veltra_value* dictionary) {
+  if (!dictionary) return VELTRA_OK;
+  if (!dictionary->entries()) return VELTRA_INVALID;
+  return fits(*dictionary) ? VELTRA_OK : VELTRA_TOO_LARGE;
 }
 
 Value sessionInfo(const veltra_session_options& options) {
@@ -73,8 +76,7 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
 
 // A call whose only argument is a dictionary, which is left out if it is null.
 CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary) {
-  if (!absentOrDictionary(dictionary)) return {VELTRA_INVALID, {}};
-  if (!fits(dictionary)) return {VELTRA_TOO_LARGE, {}};
+  if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
   Entries arguments;
   if (dictionary) arguments.emplace_back(argument, dictionaryOfNode(dictionary));
   return callFrame(operation, std::move(arguments));
@@ -88,8 +90,7 @@ CallFrame callFrame(const char* operation, Entries arguments) {
 
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag) {
-  if (!absentOrDictionary(payload)) return {VELTRA_INVALID, {}};
-  if (!fits(payload)) return {VELTRA_TOO_LARGE, {}};
+  if (const auto status = verdictOn(payload); status != VELTRA_OK) return {status, {}};
   Entries message;
   message.reserve(4);
   message.emplace_back(wire::kVeltraMessageParametersCategory, static_cast<unsigned>(category));
@@ -112,8 +113,7 @@ CallFrame statesFrame(const veltra_value* userInfo) {
 }
 
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
-  if (!absentOrDictionary(options.user_info)) return {VELTRA_INVALID, {}};
-  if (!fits(options.user_info)) return {VELTRA_TOO_LARGE, {}};
+  if (const auto status = verdictOn(options.user_info); status != VELTRA_OK) return {status, {}};
   Entries arguments = identity(options);
   arguments.emplace_back(key::kHasAggregationBlock, options.aggregated != nullptr);
   return callFrame(operation::kSetSessionInfo, std::move(arguments));
@@ -121,8 +121,9 @@ CallFrame sessionInfoFrame(const veltra_session_options& options) {
 
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload) {
-  if (!absentOrDictionary(who.user_info) || !absentOrDictionary(payload)) return {VELTRA_INVALID, {}};
-  if (!fits(who.user_info) || !fits(payload)) return {VELTRA_TOO_LARGE, {}};
+  for (const veltra_value* dictionary : {who.user_info, payload}) {
+    if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
+  }
   Entries arguments = identity(who);
   arguments.emplace_back(key::kCategory, static_cast<unsigned>(category));
   if (payload) arguments.emplace_back(key::kPayload, dictionaryOfNode(payload));
@@ -148,7 +149,7 @@ std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
 
 CallFrame logDataFrame(const veltra_value* data) {
   if (!data || !data->items()) return {VELTRA_INVALID, {}};
-  if (!fits(data)) return {VELTRA_TOO_LARGE, {}};
+  if (!fits(*data)) return {VELTRA_TOO_LARGE, {}};
   return frameOfKind(wire::FrameKind::largeCall, operation::kUploadLogData,
                      {{key::kData, valueOfNode(*data)}});
 }

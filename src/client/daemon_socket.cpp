@@ -22,8 +22,6 @@ namespace key = wire::key;
 
 namespace {
 
-using SteadyTime = std::chrono::steady_clock::time_point;
-
 std::string errorText(int number) {
   return std::error_code(number, std::generic_category()).message();
 }
@@ -116,30 +114,6 @@ bool sendAll(int socket, std::string_view bytes) {
   return true;
 }
 
-enum class Came { frame, end, timeout, impossible };
-
-Came receiveFrame(DaemonSocket& daemon, SteadyTime deadline, wire::Frame& frame) {
-  for (;;) {
-    switch (daemon.reader.next(frame)) {
-      case wire::FrameReader::Next::frame:
-        return Came::frame;
-      case wire::FrameReader::Next::impossible:
-        return Came::impossible;
-      case wire::FrameReader::Next::needMore:
-        break;
-    }
-    const auto left =
-        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
-    if (left <= 0) return Came::timeout;
-    pollfd watched{daemon.socket.get(), POLLIN, 0};
-    if (::poll(&watched, 1, static_cast<int>(left)) <= 0) continue;  // the clock decides
-    const auto [bytes, room] = daemon.reader.room();
-    const ssize_t count = ::recv(daemon.socket.get(), bytes, room, MSG_DONTWAIT);
-    if (count > 0) daemon.reader.received(static_cast<std::size_t>(count));
-    if (count == 0 || (count < 0 && errno != EAGAIN && errno != EINTR)) return Came::end;
-  }
-}
-
 // Absent if the daemon's hello is valid.
 std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const std::string& shown) {
   const auto parsed = parseBinaryPropertyList(frame.body);
@@ -166,6 +140,29 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
 
 }  // namespace
 
+Received receiveFrame(DaemonSocket& daemon, std::chrono::steady_clock::time_point deadline,
+                      wire::Frame& frame) {
+  for (;;) {
+    switch (daemon.reader.next(frame)) {
+      case wire::FrameReader::Next::frame:
+        return Received::frame;
+      case wire::FrameReader::Next::impossible:
+        return Received::impossible;
+      case wire::FrameReader::Next::needMore:
+        break;
+    }
+    const auto left =
+        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
+    if (left <= 0) return Received::timeout;
+    pollfd watched{daemon.socket.get(), POLLIN, 0};
+    if (::poll(&watched, 1, static_cast<int>(left)) <= 0) continue;  // the clock decides
+    const auto [bytes, room] = daemon.reader.room();
+    const ssize_t count = ::recv(daemon.socket.get(), bytes, room, MSG_DONTWAIT);
+    if (count > 0) daemon.reader.received(static_cast<std::size_t>(count));
+    if (count == 0 || (count < 0 && errno != EAGAIN && errno != EINTR)) return Received::end;
+  }
+}
+
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience) {
   const auto deadline = std::chrono::steady_clock::now() + patience;
@@ -180,19 +177,19 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
   const std::string shown = escapedForLog(path);
   wire::Frame frame;
   switch (receiveFrame(daemon, deadline, frame)) {
-    case Came::frame:
+    case Received::frame:
       break;
-    case Came::timeout:
+    case Received::timeout:
       return Failure{
           noDaemon(fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or "
                                "overloaded.",
                                shown, std::chrono::duration<double>(patience).count()))};
-    case Came::end:
+    case Received::end:
       return Failure{
           noDaemon(fmt::format("The daemon on {} ended the connection without a word: start veltrad "
                                "again, or see its log.",
                                shown))};
-    case Came::impossible:
+    case Received::impossible:
       return Failure{notVeltrad(shown)};
   }
   if (auto failure = verdictOnGreeting(frame, shown)) return Failure{std::move(*failure)};

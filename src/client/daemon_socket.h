@@ -32,4 +32,10 @@ struct DaemonSocket {
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience = kGreetingTimeout);
 
+// impossible: the bytes are no frame. end: the daemon has ended the connection.
+enum class Received { frame, end, timeout, impossible };
+// Waits until `deadline` for a whole frame.
+Received receiveFrame(DaemonSocket& daemon, std::chrono::steady_clock::time_point deadline,
+                      wire::Frame& frame);
+
 }  // namespace veltrad::client

@@ -24,7 +24,7 @@ constexpr off_t kMostBytes = 0x7fffffff;  // the daemon's limit
 std::string absolute(const std::string& path) {
   if (!path.empty() && path.front() == '/') return path;
   char* current = ::getcwd(nullptr, 0);
-  const std::string whole = current ? std::string(current) + '/' + path : path;
+  std::string whole = current ? std::string(current) + '/' + path : path;
   ::free(current);
   return whole;
 }

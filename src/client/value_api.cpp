@@ -72,17 +72,6 @@ veltra_status veltra_dictionary_set(veltra_value* dictionary, const char* key, v
   return VELTRA_INVALID;
 }
 
-veltra_value* veltra_retain(const veltra_value* value) {
-  auto* shared = const_cast<veltra_value*>(value);
-  if (shared) shared->references.fetch_add(1, std::memory_order_relaxed);
-  return shared;
-}
-
-void veltra_release(const veltra_value* value) {
-  auto* shared = const_cast<veltra_value*>(value);
-  if (shared && shared->references.fetch_sub(1, std::memory_order_acq_rel) == 1) delete shared;
-}
-
 veltra_type veltra_type_of(const veltra_value* value) {
   if (!value) return VELTRA_TYPE_NONE;
   if (value->items()) return VELTRA_TYPE_ARRAY;

@@ -11,6 +11,17 @@ std::size_t plus(std::size_t a, std::size_t b) {
 
 }  // namespace
 
+veltra_value* veltra_retain(const veltra_value* value) {
+  auto* shared = const_cast<veltra_value*>(value);
+  if (shared) shared->references.fetch_add(1, std::memory_order_relaxed);
+  return shared;
+}
+
+void veltra_release(const veltra_value* value) {
+  auto* shared = const_cast<veltra_value*>(value);
+  if (shared && shared->references.fetch_sub(1, std::memory_order_acq_rel) == 1) delete shared;
+}
+
 veltra_value::~veltra_value() {
   if (const Items* all = items()) {
     for (const veltra_value* item : *all) veltra_release(item);

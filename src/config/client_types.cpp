@@ -30,6 +30,20 @@ const char* entry(const Table& table, Index index) {
 const char* storebagNameForClientType(std::int32_t clientType) {
   return entry(kStorebagNames, clientType);
 }
+std::optional<std::int32_t> clientTypeWithStorebag(std::string_view name) {
+  for (std::int32_t type = 0; type < kVeltraClientTypeCount; ++type) {
+    const char* known = storebagNameForClientType(type);
+    if (known && known == name) return type;
+  }
+  return std::nullopt;
+}
+std::set<std::string> storebagNames() {
+  std::set<std::string> names;
+  for (const char* name : kStorebagNames) {
+    if (name) names.insert(name);
+  }
+  return names;
+}
 const char* senderCodeForComponentType(std::int32_t componentType) {
   return entry(kSenderCodes, componentType);
 }

@@ -2,6 +2,10 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
+#include <set>
+#include <string>
+#include <string_view>
 
 namespace veltrad::config {
 
@@ -11,6 +15,10 @@ inline constexpr std::int32_t kVeltraClientTypeCount = 18;
 // The last path component of the storebag's URL. Null for client types without a storebag, and outside the
 // range.
 const char* storebagNameForClientType(std::int32_t clientType);
+// The first client type that has this storebag.
+std::optional<std::int32_t> clientTypeWithStorebag(std::string_view name);
+// All, each once.
+std::set<std::string> storebagNames();
 
 // The code that identifies sessions of this type in reports. Null outside the range.
 const char* senderCodeForComponentType(std::int32_t componentType);

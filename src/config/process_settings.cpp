@@ -4,15 +4,13 @@
 #include <algorithm>
 #include <utility>
 
+#include "config/preference_keys.h"
 #include "platform/log.h"
 #include "platform/preferences.h"
 #include "support/device_identity.h"
 
 namespace veltrad::config {
 namespace {
-
-constexpr std::uint32_t kEnvironmentCount = 5;
-constexpr std::uint32_t kInternalEnvironment = 2;
 
 constexpr const char* kInternalStorebagHost = "storebags.internal.example";
 constexpr const char* kPublicStorebagHost = "storebags.example";
@@ -26,6 +24,14 @@ bool looksLikeHost(const std::string& text) {
 }
 
 }  // namespace
+
+bool isExampleStorebagURL(std::string_view url) {
+  constexpr std::string_view kScheme = "https://";
+  if (!url.starts_with(kScheme)) return false;
+  url.remove_prefix(kScheme.size());
+  const std::string_view host = url.substr(0, url.find_first_of("/:"));
+  return host == kInternalStorebagHost || host == kPublicStorebagHost;
+}
 
 ProcessSettings::ProcessSettings(platform::Preferences& preferences, support::DeviceIdentity& device,
                                  platform::FileStore& files, const std::string& deploymentPath)
@@ -49,7 +55,8 @@ std::optional<std::uint32_t> ProcessSettings::currentEnvironment() {
 }
 
 std::optional<ProcessSettings::Environment> ProcessSettings::userDefaultsEnvironment() {
-  const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "environmentType");
+  const auto preference =
+      _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kEnvironmentType);
   if (!preference) return std::nullopt;
   const auto stored = preference.value() ? preference.value()->toUInt32() : std::nullopt;
   if (stored && *stored >= kEnvironmentCount) return Environment{kInternalEnvironment, stored};
@@ -68,7 +75,7 @@ std::optional<std::string> ProcessSettings::storebagServerURL() {
   }
   std::optional<std::string> found;
   if (preferred) {
-    const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, "veltra_storebag_url");
+    const auto preference = _preferences.lookUp(platform::kVeltraPreferenceDomain, preference::kStorebagURL);
     if (!preference) return std::nullopt;
     found = preference.value() ? preference.value()->toText() : std::nullopt;
   }
@@ -126,19 +133,30 @@ std::optional<std::string> ProcessSettings::storebagHost(bool internalBuild) {
   if (deployment->kind == Kind::absent) return builtIn;
   const Dictionary* hosts = deployment->kind == Kind::good ? deployment->value.asDictionary() : nullptr;
   if (hosts == nullptr) {
-    logWarning("storebagServerURL: %s; using the built-in hosts",
-               deployment->kind == Kind::broken ? deployment->error.c_str()
-                                                : (deployment->placeOf({}) + ": not a dictionary").c_str());
+    complain(
+        deployment->kind == Kind::broken ? deployment->error : deployment->placeOf({}) + ": not a dictionary",
+        "the built-in hosts");
     return builtIn;
   }
   const std::string* host = hosts->string(key);
   if (host == nullptr) return builtIn;
   if (!looksLikeHost(*host)) {
-    logWarning("storebagServerURL: %s: %s is \"%s\", expected a host name; using %s",
-               deployment->placeOf({key}).c_str(), key, host->c_str(), builtIn);
+    complain(deployment->placeOf({key}) + ": " + key + " is \"" + *host + "\", expected a host name",
+             builtIn);
     return builtIn;
   }
   return *host;
+}
+
+void ProcessSettings::complain(std::string problem, const char* hosts) {
+  logWarning("storebagServerURL: %s; using %s", problem.c_str(), hosts);
+  const Lock held(_mutex);
+  _deploymentProblem = std::move(problem);
+}
+
+std::string ProcessSettings::deploymentProblem() {
+  const Lock held(_mutex);
+  return _deploymentProblem;
 }
 
 }  // namespace veltrad::config

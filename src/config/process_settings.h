@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "base/mutex.h"
 #include "platform/local_settings.h"
@@ -19,7 +20,8 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
-constexpr std::uint32_t kSeedEnvironment = 3;  // of ProcessSettings::currentEnvironment
+// Whether the address is that of a host which stands in for one that nobody has named.
+bool isExampleStorebagURL(std::string_view url);
 
 // Each setting is computed at its first call and kept: a preference that changes later takes effect at the
 // next start. During a shortage a setting is absent, and a later call computes it. What the constructor takes
@@ -37,6 +39,8 @@ class ProcessSettings {
   std::optional<std::string> storebagServerURL();
   // Reads the deployment file again, if the address comes from there; for a broken file it stays as it is.
   void readDeploymentAgain();
+  // What is wrong with the deployment file, as it was when the address was computed; empty: nothing is known.
+  std::string deploymentProblem();
 
  private:
   // The type, and the invalid one that it replaces.
@@ -47,6 +51,7 @@ class ProcessSettings {
   std::optional<Environment> userDefaultsEnvironment();
   std::optional<std::string> deployedStorebagServerURL();
   std::optional<std::string> storebagHost(bool internalBuild);
+  void complain(std::string problem, const char* hosts);
 
   // Constant after construction.
   platform::Preferences& _preferences;
@@ -57,6 +62,7 @@ class ProcessSettings {
   std::optional<std::string> _storebagServerURL GUARDED_BY(_mutex);
   bool _fromDeployment GUARDED_BY(_mutex) = false;  // there was no preference at the first call
   platform::LocalSettings _deployment GUARDED_BY(_mutex);
+  std::string _deploymentProblem GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::config

@@ -1,6 +1,8 @@
 // Downloads storebags and verifies their signatures.
 #include "config/storebag_download.h"
 
+#include <fmt/format.h>
+
 #include <algorithm>
 #include <chrono>
 #include <limits>
@@ -60,6 +62,24 @@ bool isNotModified(const http::HTTPResponse& response, std::optional<std::string
   return false;
 }
 
+StorebagCause causeOf(const http::HTTPError& error) {
+  using Kind = http::HTTPError::Kind;
+  if (error.kind == Kind::tooLarge) return StorebagCause::noStorebag;
+  if (error.kind != Kind::transport) return StorebagCause::noAttempt;
+  switch (error.cause) {
+    case http::HTTPError::Cause::resolve:
+      return StorebagCause::resolve;
+    case http::HTTPError::Cause::connect:
+      return StorebagCause::connect;
+    case http::HTTPError::Cause::trust:
+      return StorebagCause::trust;
+    case http::HTTPError::Cause::timeout:
+    case http::HTTPError::Cause::other:
+      break;
+  }
+  return StorebagCause::noAnswer;
+}
+
 // All lines of the header, joined.
 std::optional<std::string> cacheControlOf(const http::HTTPResponse& response) {
   std::optional<std::string> all;
@@ -115,6 +135,7 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
   http::HTTPResult result = _http.perform(requestForStorebag(url, lastModified));
   if (!result) return without(url, result.error());
   http::HTTPResponse& response = result.value();
+  answer.status = response.status;
   answer.maxAge = maxAgeOfCacheControl(cacheControlOf(response));
   answer.lastModified = lastModified;
   if (isNotModified(response, answer.lastModified)) {
@@ -122,8 +143,14 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
     return answer;
   }
   auto storebag = verifiedStorebag(response.body);
-  answer.attempted = storebag || storebag.error() != Refusal::keyOutOfReach;
-  if (!storebag) return answer;
+  if (!storebag) {
+    answer.attempted = storebag.error().cause != StorebagCause::noAttempt;
+    answer.cause = storebag.error().cause;
+    answer.why = std::move(storebag.error().why);
+    answer.genuine = storebag.error().genuine;
+    return answer;
+  }
+  answer.genuine = true;
   answer.kind = StorebagAnswer::Kind::fetched;
   answer.storebag = std::move(storebag).value();
   answer.container = std::move(response.body);
@@ -134,6 +161,9 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
                                                     const http::HTTPError& error) const {
   using Kind = http::HTTPError::Kind;
   WholeStorebagAnswer answer;
+  answer.cause = causeOf(error);
+  answer.why = error.description;
+  answer.status = error.status;
   if (error.kind == Kind::tooLarge) {  // the server has answered
     answer.maxAge = kDefaultMaxAgeSeconds;
     logError("fetchStorebagWithName: propertyListWithData error %s", error.description.c_str());
@@ -152,26 +182,44 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
 
 Result<Dictionary, StorebagDownload::Refusal> StorebagDownload::verifiedStorebag(
     std::string_view body) const {
-  constexpr Failure<Refusal> kNotGenuine{Refusal::notGenuine};
+  using Cause = StorebagCause;
   const auto container = parseStorebagContainer(body);
-  if (!container)
-    logError("fetchStorebagWithName: propertyListWithData error %s", container.error().description().c_str());
-  if (!container || !container.value().signature) {
+  if (!container) {
+    const std::string& why = container.error().description();
+    logError("fetchStorebagWithName: propertyListWithData error %s", why.c_str());
     logError("fetchStorebagWithName: Signature is missing");
-    return kNotGenuine;
+    return Failure{Refusal{Cause::noStorebag, "the answer is no property list: " + why, {}}};
+  }
+  if (!container.value().signature) {
+    logError("fetchStorebagWithName: Signature is missing");
+    return Failure{Refusal{Cause::signature, "the answer is not signed: it has no \"signature\"", false}};
   }
   const auto der = _veltra.publicKeyDER();
-  if (!der) return der.error().passes() ? Failure{Refusal::keyOutOfReach} : kNotGenuine;
+  if (!der) {
+    const Cause cause = der.error().passes() ? Cause::noAttempt : Cause::publicKey;
+    return Failure{Refusal{cause, der.error().description, {}}};
+  }
   const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
-  if (!key) return kNotGenuine;
+  if (!key) {
+    return Failure{
+        Refusal{Cause::publicKey,
+                fmt::format("{} is no RSA public key in DER form of {} to {} bits", _veltra.publicKeyPath(),
+                            StorebagKey::kFewestModulusBits, StorebagKey::kMostModulusBits),
+                {}}};
+  }
   const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
-  if (!decoded) return kNotGenuine;
+  if (!decoded) {
+    return Failure{Refusal{Cause::signature, "\"signature\" or \"bag\" of the answer is no base64", false}};
+  }
   if (!key->verifies(decoded->bag, decoded->signature)) {
     logError("fetchStorebagWithName: Signature can not be verified, %p", key->identity());
-    return kNotGenuine;
+    return Failure{Refusal{Cause::signature,
+                           fmt::format("the signature is not by the key in {} (SHA-256 {})",
+                                       _veltra.publicKeyPath(), key->fingerprint()),
+                           false}};
   }
   auto storebag = parseStorebagBag(decoded->bag);
-  if (!storebag) return kNotGenuine;
+  if (!storebag) return Failure{Refusal{Cause::content, "the signed \"bag\" is no property list", true}};
   return std::move(*storebag);
 }
 

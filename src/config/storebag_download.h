@@ -45,7 +45,11 @@ class StorebagDownload {
   WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
                                             const std::optional<std::string>& lastModified);
 
-  enum class Refusal { notGenuine, keyOutOfReach };
+  struct Refusal {
+    StorebagCause cause;  // noAttempt: the key is out of reach just now
+    std::string why;
+    std::optional<bool> genuine;  // as in StorebagAnswer
+  };
   // The storebag in the bytes of a container, by the key of today. A refusal has been logged.
   Result<Dictionary, Refusal> verifiedStorebag(std::string_view container) const;
 

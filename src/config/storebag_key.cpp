@@ -1,6 +1,7 @@
 // Verifies RSA signatures with OpenSSL's EVP interface, which checks digest and padding.
 #include "config/storebag_key.h"
 
+#include <fmt/format.h>
 #include <openssl/bn.h>
 #include <openssl/core_names.h>
 #include <openssl/decoder.h>
@@ -8,23 +9,23 @@
 #include <openssl/evp.h>
 #include <openssl/provider.h>
 #include <openssl/rsa.h>
+#include <openssl/x509.h>
+
+#include "base/freed.h"
 
 namespace veltrad::config {
 namespace {
 
-template <auto Free>
-struct Deleter {
-  template <typename T>
-  void operator()(T* object) const {
-    Free(object);
-  }
+using LibraryContext = Owned<OSSL_LIB_CTX, OSSL_LIB_CTX_free>;
+using Provider = Owned<OSSL_PROVIDER, OSSL_PROVIDER_unload>;
+using PublicKey = Owned<EVP_PKEY, EVP_PKEY_free>;
+using Number = Owned<BIGNUM, BN_free>;
+using Decoder = Owned<OSSL_DECODER_CTX, OSSL_DECODER_CTX_free>;
+using DigestContext = Owned<EVP_MD_CTX, EVP_MD_CTX_free>;
+
+struct OpenSSLFree {
+  void operator()(unsigned char* bytes) const { OPENSSL_free(bytes); }
 };
-using LibraryContext = std::unique_ptr<OSSL_LIB_CTX, Deleter<OSSL_LIB_CTX_free>>;
-using Provider = std::unique_ptr<OSSL_PROVIDER, Deleter<OSSL_PROVIDER_unload>>;
-using PublicKey = std::unique_ptr<EVP_PKEY, Deleter<EVP_PKEY_free>>;
-using Number = std::unique_ptr<BIGNUM, Deleter<BN_free>>;
-using Decoder = std::unique_ptr<OSSL_DECODER_CTX, Deleter<OSSL_DECODER_CTX_free>>;
-using DigestContext = std::unique_ptr<EVP_MD_CTX, Deleter<EVP_MD_CTX_free>>;
 
 const unsigned char* bytesOf(std::string_view text) {
   return reinterpret_cast<const unsigned char*>(text.data());
@@ -92,6 +93,22 @@ bool StorebagKey::verifies(std::string_view bag, std::string_view signature) con
                                  nullptr) == 1 &&
          EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1 &&
          EVP_DigestVerify(context.get(), bytesOf(signature), signature.size(), bytesOf(bag), bag.size()) == 1;
+}
+
+std::string StorebagKey::fingerprint() const {
+  const ErrorQueueAsItWas errors;
+  unsigned char* der = nullptr;
+  const int size = i2d_PUBKEY(_held->key.get(), &der);
+  const std::unique_ptr<unsigned char, OpenSSLFree> held(der);
+  unsigned char digest[EVP_MAX_MD_SIZE];
+  std::size_t length = 0;
+  std::string text;
+  if (size <= 0 || EVP_Q_digest(_held->library.get(), "SHA256", nullptr, der, static_cast<std::size_t>(size),
+                                digest, &length) != 1) {
+    return text;
+  }
+  for (std::size_t i = 0; i < length; ++i) text += fmt::format("{:02x}", digest[i]);
+  return text;
 }
 
 int StorebagKey::modulusBits() const {

@@ -3,6 +3,7 @@
 
 #include <memory>
 #include <optional>
+#include <string>
 #include <string_view>
 #include <utility>
 
@@ -25,6 +26,8 @@ class StorebagKey {
   bool verifies(std::string_view bag, std::string_view signature) const;
 
   int modulusBits() const;
+  // SHA-256 of its SubjectPublicKeyInfo in DER, 64 lower-case hexadecimal digits.
+  std::string fingerprint() const;
   // Identifies this key object in log lines.
   const void* identity() const;
 

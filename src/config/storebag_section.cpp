@@ -6,6 +6,7 @@
 
 #include "config/client_types.h"
 #include "config/operator_settings.h"
+#include "config/preference_keys.h"
 #include "config/process_settings.h"
 #include "config/storebag_content.h"
 #include "config/storebag_store.h"
@@ -30,6 +31,18 @@ const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment)
   return *sections[place] ? &**sections[place] : nullptr;
 }
 
+// Completes the answer with the section of the environment, if there is one. Returns the storebag for its
+// other keys.
+Storebag takeSection(const Dictionary& whole, std::uint32_t environment, StorebagSectionAnswer& answer) {
+  auto storebag = parsed<Storebag>(whole);
+  if (const Dictionary* section = sectionOf(storebag, environment)) {
+    answer.kind = StorebagAnswer::Kind::fetched;
+    answer.section = parseSection(*section);
+    answer.version = storebag.version;
+  }
+  return storebag;
+}
+
 }  // namespace
 
 StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
@@ -48,7 +61,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   if (name == nullptr) {
     logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
              clientType);
-    return {};
+    StorebagSectionAnswer none;
+    none.cause = StorebagCause::noName;
+    none.why = "client type " + std::to_string(clientType) + " has no storebag";
+    return none;
   }
   const auto choices = _choices.current();
   if (!choices) {
@@ -72,21 +88,24 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) {
     answer.attempted = false;
+    answer.cause = StorebagCause::noAttempt;
+    answer.why = "the environment cannot be read just now";
     return answer;
   }
-  const auto storebag = parsed<Storebag>(whole.storebag);
-  const Dictionary* section = sectionOf(storebag, *environment);
-  if (section == nullptr) {
+  const Storebag storebag = takeSection(whole.storebag, *environment, answer);
+  if (answer.kind != Kind::fetched) {
     const char* sectionName = sectionNameForEnvironment(*environment);
     logError(
         "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
         "environment",
         clientType, sectionName != nullptr ? sectionName : "(null)");
+    if (answer.cause == StorebagCause::none) {
+      answer.cause = StorebagCause::noSection;
+      answer.why = sectionName ? "it has no section \"" + std::string(sectionName) + "\""
+                               : "environment " + std::to_string(*environment) + " names no section";
+    }
     return answer;
   }
-  answer.kind = Kind::fetched;
-  answer.section = parseSection(*section);
-  answer.version = storebag.version;
   if (storebag.refreshCycle) {
     answer.maxAge = static_cast<std::int32_t>(*storebag.refreshCycle);
     logInfo("fetchStorebagForEnvironmentAndClientType: Store bag override MaxAge=%d", answer.maxAge);
@@ -107,19 +126,15 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   if (kept.known) return kept;
   const auto whole = _download.verifiedStorebag(stored.value()->container);
   if (!whole) {
-    kept.known = whole.error() != StorebagDownload::Refusal::keyOutOfReach;
+    kept.known = whole.error().cause != StorebagCause::noAttempt;
     if (kept.known) _store.remove(name, "its signature cannot be verified");
     return kept;
   }
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) return kept;
   kept.known = true;
-  const auto storebag = parsed<Storebag>(whole.value());
-  const Dictionary* section = sectionOf(storebag, *environment);
-  if (section == nullptr) return kept;
-  kept.answer.kind = StorebagAnswer::Kind::fetched;
-  kept.answer.section = parseSection(*section);
-  kept.answer.version = storebag.version;
+  takeSection(whole.value(), *environment, kept.answer);
+  if (kept.answer.kind != StorebagAnswer::Kind::fetched) return kept;
   kept.answer.maxAge = stored.value()->maxAge;
   kept.answer.lastModified = std::move(stored.value()->lastModified);
   kept.fetchTime = stored.value()->fetchTime;

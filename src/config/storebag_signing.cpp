@@ -11,6 +11,7 @@
 #include <cstdlib>
 
 #include "base/base64.h"
+#include "base/freed.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 
@@ -18,7 +19,7 @@ namespace veltrad::config {
 namespace {
 
 using PrivateKey = std::shared_ptr<EVP_PKEY>;
-using Memory = std::unique_ptr<BIO, decltype(&BIO_free)>;
+using Memory = Owned<BIO, BIO_free>;
 
 constexpr std::size_t kMostKeyFileBytes = 1u << 16;
 
@@ -53,7 +54,7 @@ Result<SigningKey, std::string> SigningKey::load(const std::string& path) {
   platform::DiskFileStore files;
   const auto pem = files.read(path, kMostKeyFileBytes);
   if (!pem) return Failure{pem.error().description};
-  const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())), BIO_free);
+  const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())));
   PrivateKey key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
   if (!key || EVP_PKEY_is_a(key.get(), "RSA") != 1)
     return Failure{path + ": expected an RSA private key in PEM form, not encrypted"};
@@ -65,20 +66,20 @@ Result<SigningKey, std::string> SigningKey::load(const std::string& path) {
 }
 
 std::string SigningKey::privatePEM() const {
-  const Memory memory(BIO_new(BIO_s_mem()), BIO_free);
+  const Memory memory(BIO_new(BIO_s_mem()));
   if (PEM_write_bio_PKCS8PrivateKey(memory.get(), _key.get(), nullptr, nullptr, 0, nullptr, nullptr) != 1)
     abortFor("write a private key");
   return contentsOf(memory.get());
 }
 
 std::string SigningKey::publicDER() const {
-  const Memory memory(BIO_new(BIO_s_mem()), BIO_free);
+  const Memory memory(BIO_new(BIO_s_mem()));
   if (i2d_PUBKEY_bio(memory.get(), _key.get()) != 1) abortFor("write a public key");
   return contentsOf(memory.get());
 }
 
 std::string SigningKey::sign(std::string_view bag) const {
-  const std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
+  const Owned<EVP_MD_CTX, EVP_MD_CTX_free> context(EVP_MD_CTX_new());
   std::string signature(static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())), '\0');
   std::size_t length = signature.size();
   EVP_PKEY_CTX* settings = nullptr;  // owned by `context`

@@ -10,6 +10,22 @@ namespace veltrad::config {
 
 struct StorebagSection;
 
+// Why the server's word is not what a session gets, the default storebag included.
+enum class StorebagCause {
+  none,        // it is; or the copy is current
+  noAttempt,   // short of something just now, or stopping
+  noName,      // the client type has no storebag
+  resolve,     // the server's name could not be resolved
+  connect,     // nobody answers at its address
+  trust,       // its certificate is not trusted
+  noAnswer,    // cut, too late, or the address is no HTTPS address
+  noStorebag,  // an answer, but no property list
+  publicKey,   // this device has no key that could verify it
+  signature,   // missing, or not by this device's key
+  content,     // signed, but no storebag
+  noSection,   // nothing for this environment
+};
+
 struct StorebagAnswer {
   // notModified: the caller's copy is current. failed: the reason was logged.
   enum class Kind { fetched, notModified, failed };
@@ -21,6 +37,10 @@ struct StorebagAnswer {
   std::int32_t maxAge = 0;
   // For the next request: the answer's text, even if the answer was not valid, or that of this request.
   std::optional<std::string> lastModified;
+  StorebagCause cause = StorebagCause::none;
+  std::string why;              // one line about the cause; empty for `none`
+  int status = 0;               // of the HTTP answer; 0: none came
+  std::optional<bool> genuine;  // whether the signature holds; absent: nothing was verified
 };
 
 struct StorebagSectionAnswer : StorebagAnswer {

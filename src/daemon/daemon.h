@@ -17,7 +17,8 @@
 
 namespace veltrad::daemon {
 
-// The objects between the services and the listener. The services outlive it; it outlives the listener.
+// The objects between the services and the listener. The services outlive it; it outlives the listener. Its
+// 13 fields are these objects, in the order in which they need each other.
 class Daemon {
  public:
   explicit Daemon(Services& services);
@@ -25,6 +26,8 @@ class Daemon {
   backends::BackendFactory& backends() { return _factory; }
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
+  config::ProcessSettings& settings() { return _settings; }
+  config::StorebagSource& storebags() { return _storebags; }
 
  private:
   Services& _services;

@@ -7,19 +7,20 @@
 #include <cstdio>
 #include <optional>
 #include <string_view>
+#include <utility>
 
 #include "base/version.h"
 #include "daemon/daemon.h"
-#include "daemon/metrics_file.h"
+#include "daemon/doctor.h"
 #include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
-#include "platform/counters_file.h"
 #include "platform/log.h"
 #include "platform/process_start.h"
 #include "platform/run_loop.h"
 #include "platform/sandbox.h"
 #include "platform/scheduling.h"
+#include "platform/state_file.h"
 
 namespace {
 
@@ -45,6 +46,14 @@ constexpr const char* kHelp =
     "\n"
     "  --version  Print the version and exit\n"
     "  --help     Print this help and exit\n";
+
+// Before any other thread exists.
+void prepareProcess() {
+  platform::takeUtilitySchedulingClass();
+  platform::shareHeaps();
+  platform::VeltraLogging::startLogging("veltrad", "Daemon");
+  platform::raiseDescriptorLimit();
+}
 
 // Directories must exist before the sandbox is entered.
 bool makeDirectories(const platform::Root& root) {
@@ -73,8 +82,8 @@ void removeUnfinishedFiles(const platform::Root& root) {
   }
 }
 
-void enterSandbox(const platform::Root& root) {
-  const auto entered = platform::enterSandbox(platform::veltradSandboxProfile(root));
+platform::SandboxState enterSandbox(const platform::Root& root) {
+  auto entered = platform::enterSandbox(platform::veltradSandboxProfile(root));
   if (!entered.ok()) {
     logError("main: %s\n", entered.error().c_str());
     _exit(255);
@@ -84,6 +93,7 @@ void enterSandbox(const platform::Root& root) {
   } else {
     logWarning("main: %s", entered.value().line.c_str());
   }
+  return std::move(entered).value();
 }
 
 struct Sockets {
@@ -101,8 +111,22 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
+platform::StateFile::State countersState(const platform::Counters& counters, double started) {
+  return {"The counters", [&counters] { return platform::StateFile::Version{counters.total()}; },
+          [&counters, started] { return counters.json(started); }};
+}
+
+platform::StateFile::State metricsState(daemon::Observers& observers) {
+  const auto version = [&observers] {
+    const daemon::Gauges gauges = observers.gauges();
+    return platform::StateFile::Version{observers.countsTotal(), gauges.sessions, gauges.connections,
+                                        gauges.postsUnderWay};
+  };
+  return {"The metrics", version, [&observers] { return observers.metricsText(); }};
+}
+
 void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
-           platform::CountersFile& countersFile, daemon::MetricsFile& metricsFile, platform::RunLoop& loop) {
+           platform::StateFile& countersFile, platform::StateFile& metricsFile, platform::RunLoop& loop) {
   daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
@@ -138,7 +162,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
 // then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
 bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& control,
-          platform::CountersFile& countersFile) {
+          platform::StateFile& countersFile) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
@@ -177,17 +201,14 @@ int main(int count, char** arguments) {
                              "LC_MESSAGES", "LANG", "TZ", "NOTIFY_SOCKET", "LISTEN_PID", "LISTEN_FDS",
                              "LISTEN_FDNAMES", "WATCHDOG_PID", "WATCHDOG_USEC", "JOURNAL_STREAM"});
   if (answerArguments(count, arguments)) return 0;
-  platform::takeUtilitySchedulingClass();
-  platform::shareHeaps();
-  platform::VeltraLogging::startLogging("veltrad", "Daemon");
-  platform::raiseDescriptorLimit();
+  prepareProcess();
   platform::RunLoop loop;
   loop.blockSignals();
 
   daemon::Services services(platform::Root::fromEnvironment());
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
-  enterSandbox(services.root);
+  auto sandbox = enterSandbox(services.root);
   auto sockets = openSockets(services);
   if (!sockets) {
     logError("main: %s", sockets.error().c_str());
@@ -196,18 +217,20 @@ int main(int count, char** arguments) {
   removeUnfinishedFiles(services.root);
 
   services.writer.start();
-  platform::CountersFile countersFile(services.counters, services.files, services.writer,
-                                      services.root.countersPath(), started);
+  platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
+                                   services.root.countersPath());
   daemon::Daemon daemon(services);
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
                           services.counters, services.memory, services.root.entitlementsPath()},
                          daemon.agent());
-  daemon::Observers observers(services, daemon.agent(), listener, started);
+  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, started);
   ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
                          services.counters, services.observersMemory, services.root.entitlementsPath(),
                          kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
                         observers);
-  daemon::MetricsFile metricsFile(observers, services.files, services.writer, services.root.metricsPath());
+  platform::StateFile metricsFile(metricsState(observers), services.files, services.writer,
+                                  services.root.metricsPath());
   if (!listener.resume() || !control.resume()) return 1;
   platform::forbidExit();
   services.serviceManager.ready();

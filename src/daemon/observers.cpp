@@ -3,6 +3,9 @@
 
 #include <fmt/format.h>
 
+#include "base/version.h"
+#include "daemon/doctor.h"
+#include "daemon/refresh.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
 #include "http/http_queue.h"
@@ -23,6 +26,8 @@ struct Observers::Question {
   std::string_view name;
   Right right;
   Answer (Observers::*answer)(const Dictionary& arguments);
+  // Instead, where the answer depends on who asks.
+  Answer (Observers::*answerTo)(const Dictionary& arguments, ipc::Connection& caller) = nullptr;
 };
 
 const Observers::Question* Observers::questionNamed(const std::string& name) {
@@ -30,6 +35,12 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kStatus, Right::observe, &Observers::status},
       {question::kSessions, Right::observe, &Observers::sessions},
       {question::kMetrics, Right::observe, &Observers::metrics},
+      {question::kVersions, Right::observe, &Observers::versions},
+      {question::kConfig, Right::control, &Observers::preferences},
+      {question::kSetConfig, Right::control, &Observers::setPreference},
+      {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
+      {question::kRefresh, Right::control, &Observers::refresh},
+      {question::kDoctor, Right::observe, nullptr, &Observers::doctor},
   };
   for (const Question& question : kQuestions) {
     if (question.name == name) return &question;
@@ -47,8 +58,7 @@ class Observers::Desk final : public ipc::Observer {
                                  std::shared_ptr<ipc::PendingReply> reply) override {
     const Question* question = questionNamed(operation);
     if (!question) return ipc::unknownOperation(operation);
-    Answer answer =
-        may(question->right) ? (_observers.*question->answer)(arguments) : refused(question->right);
+    Answer answer = may(question->right) ? answered(*question, arguments) : refused(question->right);
     if (!reply) return std::nullopt;
     if (answer) {
       reply->answer(std::move(answer.value()));
@@ -59,6 +69,10 @@ class Observers::Desk final : public ipc::Observer {
   }
 
  private:
+  Answer answered(const Question& question, const Dictionary& arguments) {
+    return question.answerTo ? (_observers.*question.answerTo)(arguments, _connection)
+                             : (_observers.*question.answer)(arguments);
+  }
   bool holds(const char* entitlement) {
     const auto value = _connection.valueForEntitlement(entitlement);
     return value && value->isBoolean() && *value->toBoolean();
@@ -79,8 +93,14 @@ class Observers::Desk final : public ipc::Observer {
   ipc::Connection& _connection;
 };
 
-Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started)
-    : _services(services), _agent(agent), _clients(clients), _started(started) {}
+Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
+                     double started)
+    : _services(services),
+      _agent(agent),
+      _clients(clients),
+      _doctor(doctor),
+      _started(started),
+      _preferences(services.preferences, services.device) {}
 
 bool Observers::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
   connection->setObserver(std::make_shared<Desk>(*this, *connection));
@@ -111,6 +131,39 @@ Observers::Answer Observers::sessions(const Dictionary& arguments) {
 
 Observers::Answer Observers::metrics(const Dictionary&) {
   return Dictionary{{"text", metricsText()}};
+}
+
+Observers::Answer Observers::versions(const Dictionary&) {
+  return Dictionary{{"veltrad", kVersion}, {"libraries", http::transportLibraries()}};
+}
+
+Observers::Answer Observers::preferences(const Dictionary&) {
+  return _preferences.list();
+}
+
+Observers::Answer Observers::setPreference(const Dictionary& arguments) {
+  return _preferences.set(arguments);
+}
+
+Observers::Answer Observers::unsetPreference(const Dictionary& arguments) {
+  return _preferences.unset(arguments);
+}
+
+Observers::Answer Observers::refresh(const Dictionary& arguments) {
+  const std::string* name = arguments.string("name");
+  if (!name) return Failure{std::string("argument \"name\" must be a text")};
+  return refreshStorebag(_agent.storebags(), *name);
+}
+
+Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection& caller) {
+  std::vector<std::int32_t> types;
+  const Array* asked = arguments.array("clientTypes");
+  for (const Value& value : asked ? *asked : Array()) {
+    const auto type = value.toInt32();
+    if (!type) return Failure{std::string("argument \"clientTypes\" must hold numbers")};
+    types.push_back(*type);
+  }
+  return _doctor.examine(caller, _agent.storebags(), types);
 }
 
 Gauges Observers::gauges() {

@@ -6,6 +6,7 @@
 
 #include "base/result.h"
 #include "base/value.h"
+#include "config/preference_editor.h"
 #include "daemon/metrics.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
@@ -16,6 +17,7 @@ class Listener;
 
 namespace veltrad::daemon {
 
+class Doctor;
 class VeltradAgent;
 
 // Each connection's thread asks on its own. Nothing of it opens a session or a transaction. What the
@@ -23,7 +25,7 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, double started);
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -43,12 +45,20 @@ class Observers final : public ipc::ListenerDelegate {
   Answer status(const Dictionary& arguments);
   Answer sessions(const Dictionary& arguments);
   Answer metrics(const Dictionary& arguments);
+  Answer versions(const Dictionary& arguments);
+  Answer preferences(const Dictionary& arguments);
+  Answer setPreference(const Dictionary& arguments);
+  Answer unsetPreference(const Dictionary& arguments);
+  Answer refresh(const Dictionary& arguments);
+  Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
+  Doctor& _doctor;
   const double _started;
+  config::PreferenceEditor _preferences;
 };
 
 }  // namespace veltrad::daemon

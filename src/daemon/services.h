@@ -22,7 +22,7 @@
 
 namespace veltrad::daemon {
 
-// Its 18 fields are the services of the whole process.
+// Its 19 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),

@@ -107,9 +107,7 @@ Dictionary statusOfDaemon(const DaemonFacts& facts) {
 
 Array statusOfStorebags(StorebagCache& cache, double now) {
   auto records = cache.records();
-  for (std::int32_t type = 0; type < config::kVeltraClientTypeCount; ++type) {
-    if (const char* name = config::storebagNameForClientType(type)) records.try_emplace(name);
-  }
+  for (const std::string& name : config::storebagNames()) records.try_emplace(name);
   Array storebags;
   for (const auto& [name, record] : records) storebags.push_back(statusOfStorebag(name.c_str(), record, now));
   return storebags;

@@ -38,18 +38,37 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
     lastModified = record.lastModified;
     record.beingFetched = true;
   }
+  config::StorebagSectionAnswer answer = fetched(clientType, name, lastModified);
+  if (!name) return nullptr;
+  const Lock held(_lock);
+  return taken(clientType, _cachedStorebags[name], std::move(answer));
+}
+
+config::StorebagAnswer StorebagCache::refresh(std::int32_t clientType) {
+  const char* name = config::storebagNameForClientType(clientType);
+  recall(clientType, name);
+  {
+    const Lock held(_lock);
+    settledRecord(name).beingFetched = true;
+  }
+  config::StorebagSectionAnswer answer = fetched(clientType, name, std::nullopt);
+  config::StorebagAnswer told = answer;
+  const Lock held(_lock);
+  taken(clientType, _cachedStorebags[name], std::move(answer));
+  return told;
+}
+
+// The record, where there is one, is marked as being fetched.
+config::StorebagSectionAnswer StorebagCache::fetched(std::int32_t clientType, const char* name,
+                                                     const std::optional<std::string>& lastModified) {
   logDebug("fetchAndCacheStorebag: Fetching storebag for client type %d", clientType);
-  config::StorebagSectionAnswer answer;
   try {
-    answer = _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
+    return _source.fetchStorebagForEnvironmentAndClientType(clientType, lastModified);
   } catch (const std::bad_alloc&) {
     const Lock held(_lock);
     if (name) settle(_cachedStorebags[name]);
     throw;
   }
-  if (!name) return nullptr;
-  const Lock held(_lock);
-  return taken(clientType, _cachedStorebags[name], std::move(answer));
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) {

@@ -48,11 +48,16 @@ class StorebagCache {
 
   // The section for the client type, or null. May wait for a download for the same name, without the lock.
   std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
+  // Fetches the storebag of a client type that has one, however fresh or failed its record is, without a
+  // condition, and takes the answer into the record as ever. May wait as above, and then for the server.
+  config::StorebagAnswer refresh(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
   // By name; a record being fetched is as its last attempt left it.
   std::map<std::string, StorebagRecord> records();
 
  private:
+  config::StorebagSectionAnswer fetched(std::int32_t clientType, const char* name,
+                                        const std::optional<std::string>& lastModified) EXCLUDES(_lock);
   // Called at the first use of a name: takes over what an earlier daemon has kept of it.
   void recall(std::int32_t clientType, const std::string& name);
   // Called when the fetch of a record has ended.

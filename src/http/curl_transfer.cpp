@@ -19,8 +19,9 @@ namespace veltrad::http {
 
 namespace {
 
-// libcurl's text.
+// libcurl's texts.
 constexpr std::string_view kNoResolverThread = "getaddrinfo() thread failed to start";
+constexpr std::string_view kResolvingTimedOut = "Resolving timed out";
 constexpr long kConnectSeconds = 10;
 constexpr long kLowSpeedSeconds = 60;
 constexpr std::size_t kMostHeaderBytes = 64u << 10;
@@ -129,7 +130,9 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_OPENSOCKETDATA, this);
   options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
   options.set(CURLOPT_CLOSESOCKETDATA, _connections);
-  options.set(CURLOPT_FRESH_CONNECT, metEndedConnection() ? 1L : 0L);
+  // Who asks for a storebag is told whether its server is trusted now, not when a kept connection was made.
+  const bool fresh = metEndedConnection() || _request.lane == HTTPRequest::Lane::storebag;
+  options.set(CURLOPT_FRESH_CONNECT, fresh ? 1L : 0L);
   _connection = Connection::kept;
   _error[0] = '\0';
   options.set(CURLOPT_ERRORBUFFER, _error.data());
@@ -295,7 +298,7 @@ HTTPResult CurlTransfer::result(CURLcode code) {
   curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
   const bool statusCounts = code == CURLE_OK || (answerTooLarge() && !_request.keepsAnswer);
   if (statusCounts) return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body)};
-  HTTPError error{kindOf(code), {}, static_cast<int>(status)};
+  HTTPError error{kindOf(code), {}, static_cast<int>(status), causeOf(code)};
   try {
     error.description = describe(code);
   } catch (const std::bad_alloc&) {
@@ -313,6 +316,23 @@ HTTPError::Kind CurlTransfer::kindOf(CURLcode code) const {
     return Kind::shortage;
   const bool neededFiles = code == CURLE_COULDNT_RESOLVE_HOST || code == CURLE_PEER_FAILED_VERIFICATION;
   return neededFiles && descriptorsAreShort() ? Kind::shortage : Kind::transport;
+}
+
+HTTPError::Cause CurlTransfer::causeOf(CURLcode code) const {
+  using Cause = HTTPError::Cause;
+  switch (code) {
+    case CURLE_COULDNT_RESOLVE_HOST:
+      return Cause::resolve;
+    case CURLE_COULDNT_CONNECT:
+      return Cause::connect;
+    case CURLE_PEER_FAILED_VERIFICATION:
+      return Cause::trust;
+    case CURLE_OPERATION_TIMEDOUT:
+      return std::string_view(_error.data()).starts_with(kResolvingTimedOut) ? Cause::resolve
+                                                                             : Cause::timeout;
+    default:
+      return Cause::other;
+  }
 }
 
 std::string CurlTransfer::describe(CURLcode code) const {
@@ -337,7 +357,8 @@ HTTPResult CurlTransfer::timedOutWaiting() const {
   try {
     return Failure{HTTPError{HTTPError::Kind::transport,
                              "Timed out after " + std::to_string(_request.timeout.count()) +
-                                 " milliseconds while waiting for a connection to " + _host}};
+                                 " milliseconds while waiting for a connection to " + _host,
+                             0, HTTPError::Cause::timeout}};
   } catch (const std::bad_alloc&) {
     return Failure{outOfMemory()};
   }

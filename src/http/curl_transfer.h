@@ -16,7 +16,7 @@
 namespace veltrad::http {
 
 // Constructed on the caller's thread, then used only on the HTTP thread. `connections` must exist while an
-// easy handle is attached. Its 24 fields are the request, what libcurl is given, and the answer as it
+// easy handle is attached. Its 23 fields are the request, what libcurl is given, and the answer as it
 // arrives.
 class CurlTransfer {
  public:
@@ -66,6 +66,7 @@ class CurlTransfer {
   void collectHeader(std::string_view line);
   bool answerTooLarge() const { return _received > _request.mostResponseBytes; }
   HTTPError::Kind kindOf(CURLcode code) const;
+  HTTPError::Cause causeOf(CURLcode code) const;
   std::string describe(CURLcode code) const;
 
   static curl_socket_t openSocket(void* self, curlsocktype, curl_sockaddr* address);

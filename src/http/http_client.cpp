@@ -313,4 +313,8 @@ std::size_t CurlHTTPClient::underWay() const {
   return _impl->queue.events();
 }
 
+std::string transportLibraries() {
+  return curl_version();
+}
+
 }  // namespace veltrad::http

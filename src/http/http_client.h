@@ -80,6 +80,9 @@ struct HTTPError {
   std::string description;
   // Of an incomplete answer; 0 if none arrived.
   int status = 0;
+  // Where a transport error ended the exchange.
+  enum class Cause { other, resolve, connect, trust, timeout };
+  Cause cause = Cause::other;
 };
 
 // What the request keeps until its completion has run, including libcurl's copies, without the completion
@@ -105,6 +108,9 @@ struct HTTPClientSettings {
   // Certificates in PEM form that are trusted besides the system's. The file may be missing.
   std::string extraCertificatesPath;
 };
+
+// "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
+std::string transportLibraries();
 
 // libcurl's multi interface on one thread, which the first request starts. Never forks; SIGPIPE must be
 // ignored.

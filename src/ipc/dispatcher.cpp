@@ -259,7 +259,7 @@ Result<Decoded, std::string> decode(const wire::Frame& frame, CallMemory& memory
         static_cast<unsigned>(kind))};
   }
   auto decoded = large ? decodeLargeCall(frame, memory) : decodeCall(frame, memory);
-  if (!decoded) return Failure{std::move(decoded.error())};
+  if (!decoded) return Failure{decoded.error()};
   Dictionary& body = decoded.value();
   auto given = body.take(key::kArguments);
   const std::string* name = body.string(key::kOperation);
@@ -280,7 +280,7 @@ Refusal dispatch(const wire::Frame& frame, const std::shared_ptr<OutQueue>& out,
   std::shared_ptr<PendingReply> pending;
   if (frame.header.callID != 0) pending = std::make_shared<PendingReply>(out, frame.header.callID);
   auto decoded = decode(frame, memory);
-  Refusal refusal = decoded ? run(decoded.value(), pending) : Refusal(std::move(decoded.error()));
+  Refusal refusal = decoded ? run(decoded.value(), pending) : Refusal(decoded.error());
   if (refusal && pending) {
     const char* what = memory.usedUp ? "The call was not run" : "The call cannot be read";
     pending->fail(wire::makeReportingError(fmt::format("{}: {}.", what, toUTF8(*refusal)), -1));

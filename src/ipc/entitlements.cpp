@@ -56,13 +56,15 @@ struct ReadRules {
   Array rules;
   std::optional<std::string> error;
   std::vector<std::string> warnings;
+  bool missing = false;
 };
 
 ReadRules rulesIn(const platform::LocalContent& content) {
   using Kind = platform::LocalContent::Kind;
   ReadRules read;
   if (content.warning) read.warnings.push_back(*content.warning);
-  if (content.kind == Kind::absent) return read;
+  read.missing = content.kind == Kind::absent;
+  if (read.missing) return read;
   const Array* rules = content.kind == Kind::good ? content.value.asArray() : nullptr;
   if (!rules) {
     read.error = content.kind == Kind::broken
@@ -101,6 +103,14 @@ std::optional<Value> entitlementInRules(const Array& rules, std::string_view nam
   return std::nullopt;
 }
 
+bool anybodyIsGranted(const Array& rules, std::string_view name) {
+  return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
+    if (problemOf(value)) return false;
+    const Value* granted = value.asDictionary()->dictionary("entitlements")->find(name);
+    return granted && granted->isBoolean() && *granted->toBoolean();
+  });
+}
+
 bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
   return std::any_of(rules.begin(), rules.end(), [&](const Value& value) {
     const Dictionary* rule = value.asDictionary();
@@ -130,6 +140,7 @@ void Entitlements::refresh(Said& said) {
   _content = std::move(now).value();
   ReadRules fresh = rulesIn(*_content);
   _rules = std::move(fresh.rules);
+  _state = {fresh.missing, fresh.error.value_or(""), fresh.warnings, false};
   said.error = std::move(fresh.error);
   said.warnings = std::move(fresh.warnings);
 }
@@ -154,6 +165,21 @@ std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, co
   }
   say(said);
   return found;
+}
+
+std::optional<RulesState> Entitlements::stateFor(std::string_view name) {
+  Said said;
+  std::optional<RulesState> state;
+  {
+    Lock lock(_mutex);
+    refresh(said);
+    if (!said.shortage) {
+      state = _state;
+      state->grants = anybodyIsGranted(_rules, name);
+    }
+  }
+  say(said);
+  return state;
 }
 
 bool Entitlements::mayHold(std::string_view name, unsigned uid) {

@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/mutex.h"
 #include "base/value.h"
@@ -13,6 +14,14 @@
 #include "platform/local_settings.h"
 
 namespace veltrad::ipc {
+
+// What the rules give, for those who look for a fault.
+struct RulesState {
+  bool missing = false;               // there is no file
+  std::string error;                  // why it cannot be used; empty: it can
+  std::vector<std::string> warnings;  // about single rules
+  bool grants = false;                // some rule grants the entitlement to somebody
+};
 
 // The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
 // rule with more than one of the three matches when all of them match, one with none never. A missing or
@@ -26,6 +35,9 @@ class Entitlements {
   // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
   // False if no rule can grant it to this user, whatever the groups and the unit of the process.
+  // How the file stands, and whether anybody is granted this. Nothing: it cannot be read just now.
+  std::optional<RulesState> stateFor(std::string_view name);
+  // False: no rule grants it to this user, whatever groups and unit a process of his has.
   bool mayHold(std::string_view name, unsigned uid);
   // Reads the file now, whether it has changed or not.
   void readAgain();
@@ -39,6 +51,7 @@ class Entitlements {
   platform::LocalSettings _file GUARDED_BY(_mutex);
   std::shared_ptr<const platform::LocalContent> _content GUARDED_BY(_mutex);  // what the rules are from
   Array _rules GUARDED_BY(_mutex);
+  RulesState _state GUARDED_BY(_mutex);  // of that reading, without `grants`
   platform::LimitedLine _shortages{"questions"};
 };
 

@@ -81,7 +81,7 @@ wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending) {
 wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::string> text,
-                                        std::optional<wire::ReportingError> error) {
+                                        const std::optional<wire::ReportingError>& error) {
     Dictionary results;
     if (text) results.set(key::kReply, std::move(*text));
     setError(results, error);
@@ -96,7 +96,7 @@ wire::BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending) {
 
 wire::UploadLogDataReply uploadLogDataReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
-  return [pending = std::move(pending)](bool uploaded, std::optional<wire::ReportingError> error) {
+  return [pending = std::move(pending)](bool uploaded, const std::optional<wire::ReportingError>& error) {
     Dictionary results{{key::kUploaded, uploaded}};
     setError(results, error);
     pending->answer(std::move(results));

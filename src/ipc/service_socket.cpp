@@ -3,13 +3,14 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 
 #include <cerrno>
 #include <cstring>
+
+#include "platform/daemon_lock.h"
 
 namespace veltrad::ipc {
 
@@ -21,31 +22,14 @@ std::string reason(int error) {
   return std::strerror(error);
 }
 
-std::string holderOf(int lock) {
-  char text[32] = {};
-  const ssize_t count = ::pread(lock, text, sizeof text - 1, 0);
-  std::string_view number(text, count > 0 ? static_cast<std::size_t>(count) : 0);
-  number = number.substr(0, number.find_first_not_of("0123456789"));
-  return number.empty() ? "another process" : fmt::format("process {}", number);
-}
-
 Result<FileDescriptor, std::string> takeLock(const std::string& path) {
-  FileDescriptor lock(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
-  if (!lock.isOpen()) return Failure{fmt::format("The lock {} cannot be opened: {}.", path, reason(errno))};
-  if (::flock(lock.get(), LOCK_EX | LOCK_NB) != 0) {
-    if (errno != EWOULDBLOCK)
-      return Failure{fmt::format("The lock {} cannot be taken: {}.", path, reason(errno))};
-    return Failure{
-        fmt::format("The daemon is already running: {} holds {}. Stop it first, or give this one a root of "
-                    "its own in VELTRA_ROOT.",
-                    holderOf(lock.get()), path)};
-  }
-  // The process number is only for people.
-  const std::string holder = fmt::format("{}\n", ::getpid());
-  if (::ftruncate(lock.get(), 0) == 0) {
-    [[maybe_unused]] const ssize_t written = ::pwrite(lock.get(), holder.data(), holder.size(), 0);
-  }
-  return lock;
+  auto lock = platform::takeDaemonLock(path);
+  if (lock) return std::move(lock.value());
+  const platform::LockRefusal& refusal = lock.error();
+  if (!refusal.held) return Failure{fmt::format("The lock cannot be taken: {}.", refusal.description)};
+  return Failure{fmt::format(
+      "The daemon is already running: {}. Stop it first, or give this one a root of its own in VELTRA_ROOT.",
+      refusal.description)};
 }
 
 // Absent: nothing stands at the path any more. Only the holder of the lock calls it.

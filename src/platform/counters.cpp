@@ -4,8 +4,6 @@
 #include <unistd.h>
 
 #include "formats/json.h"
-#include "platform/file_store.h"
-#include "platform/log.h"
 
 namespace veltrad::platform {
 
@@ -15,23 +13,16 @@ std::uint64_t Counters::total() const {
   return sum;
 }
 
-void Counters::writeIfChanged(FileStore& files, const std::string& path, double startedAt) {
-  if (!changed()) return;
-  std::uint64_t sum = 0;  // of the counts written: other threads go on counting
+std::string Counters::json(double startedAt) const {
   std::vector<Dictionary::Entry> counts;
   for (std::size_t i = 0; i < _counts.size(); ++i) {
     const std::uint64_t times = _counts[i].load(std::memory_order_relaxed);
     if (times > 0) counts.emplace_back(wire::kReasons[i].text, times);
-    sum += times;
   }
   const Dictionary all{{"pid", static_cast<int>(::getpid())},
                        {"started", startedAt},
                        {"counts", Dictionary::fromEntries(std::move(counts))}};
-  const auto written = files.replace(path, formats::writeJSON(all) + "\n", 0644);
-  if (!written && !_failed)
-    logError("The counters could not be written: %s", written.error().description.c_str());
-  _failed = !written;
-  if (written) _sumWritten.store(sum, std::memory_order_relaxed);
+  return formats::writeJSON(all) + "\n";
 }
 
 }  // namespace veltrad::platform

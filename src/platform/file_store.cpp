@@ -40,16 +40,47 @@ std::string directoryOf(const std::string& path) {
   return slash == 0 ? "/" : path.substr(0, slash);
 }
 
-// 0, or an errno. A full disk or a quota may show only at the sync or the close.
-int writeNewFile(const std::string& path, std::string_view bytes, unsigned mode) {
+// Nothing where it is so already, which needs no right.
+int give(int file, uid_t user, gid_t group) {
+  struct stat status {};
+  if (::fstat(file, &status) != 0) return errno;
+  if (status.st_uid == user && status.st_gid == group) return 0;
+  return ::fchown(file, user, group) == 0 ? 0 : errno;
+}
+
+// What a new file gets; without an owner it stays this process's.
+struct Belonging {
+  unsigned mode;
+  std::optional<std::pair<uid_t, gid_t>> owner;
+};
+
+Result<Belonging, FileFailure> inheritedFrom(const std::string& path, unsigned mode) {
+  struct stat status {};
+  if (::lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode))
+    return Belonging{status.st_mode & 07777u, {{status.st_uid, status.st_gid}}};
+  const std::string directory = directoryOf(path);
+  if (::stat(directory.c_str(), &status) != 0) return Failure{failureOf(directory, errno)};
+  return Belonging{mode, {{status.st_uid, status.st_gid}}};
+}
+
+// A full disk or a quota may show at the sync or the close alone.
+int writeNewFile(const std::string& path, std::string_view bytes, const Belonging& belonging) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (!file.isOpen()) return errno;
   int error = writeAll(file.get(), bytes);
-  if (error == 0 && ::fchmod(file.get(), mode) != 0) error = errno;  // regardless of the umask
+  if (error == 0 && belonging.owner)
+    error = give(file.get(), belonging.owner->first, belonging.owner->second);
+  // Exactly this mode, whatever the umask.
+  if (error == 0 && ::fchmod(file.get(), belonging.mode) != 0) error = errno;
   if (error == 0 && ::fsync(file.get()) != 0) error = errno;
   if (::close(file.release()) != 0 && error == 0) error = errno;
   if (error != 0) ::unlink(path.c_str());
   return error;
+}
+
+int inheritOwner(const std::string& directory) {
+  const FileDescriptor made(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  return made.isOpen() ? giveToOwnerOfDirectory(made.get(), directory) : errno;
 }
 
 int syncDirectory(const std::string& path) {
@@ -111,7 +142,9 @@ Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, st
 Result<Done, FileFailure> DiskFileStore::replace(const std::string& path, std::string_view bytes,
                                                  unsigned mode) {
   const std::string fresh = path + "." + randomUUIDText().substr(0, 8) + ".new";
-  if (const int error = writeNewFile(fresh, bytes, mode)) return Failure{failureOf(path, error)};
+  auto belonging = _ownership == Ownership::own ? Belonging{mode, {}} : inheritedFrom(path, mode);
+  if (!belonging) return Failure{belonging.error()};
+  if (const int error = writeNewFile(fresh, bytes, belonging.value())) return Failure{failureOf(path, error)};
   if (::rename(fresh.c_str(), path.c_str()) != 0) {
     const int error = errno;
     ::unlink(fresh.c_str());
@@ -149,10 +182,19 @@ Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   return FileStamp(hash);
 }
 
-Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode) {
+int giveToOwnerOfDirectory(int file, const std::string& path) {
+  struct stat status {};
+  if (::stat(directoryOf(path).c_str(), &status) != 0) return errno;
+  return give(file, status.st_uid, status.st_gid);
+}
+
+Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode, Ownership ownership) {
   for (std::size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
-    if (::mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
+    if (::mkdir(part.c_str(), mode) == 0) {
+      const int error = ownership == Ownership::inherited ? inheritOwner(part) : 0;
+      if (error != 0) return Failure{failureOf(part, error)};
+    } else if (errno != EEXIST) {
       const int error = errno;
       // An existing parent on a read-only or inaccessible file system is no error.
       struct stat status {};
@@ -163,6 +205,14 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) return Failure{failureOf(path, errno)};
   if (!S_ISDIR(status.st_mode)) return Failure{failureOf(path, ENOTDIR)};
+  return Done();
+}
+
+Result<Done, FileFailure> tryWritingIn(const std::string& directory) {
+  if (auto made = makeDirectories(directory); !made) return made;
+  const std::string path = directory + "/tried." + randomUUIDText().substr(0, 8) + ".new";
+  if (const int error = writeNewFile(path, ".", {})) return Failure{failureOf(directory, error)};
+  ::unlink(path.c_str());
   return Done();
 }
 

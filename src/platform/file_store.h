@@ -40,20 +40,39 @@ class FileStore {
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
 };
 
+// Whose what is written is. inherited: of the owner and mode of the file that is replaced, and what is new
+// belongs to the owner of its directory: so that root leaves nothing behind that the daemon's user cannot
+// use.
+enum class Ownership { own, inherited };
+
 class DiskFileStore final : public FileStore {
  public:
+  explicit DiskFileStore(Ownership ownership = Ownership::own) : _ownership(ownership) {}
   Result<std::string, FileFailure> read(const std::string& path, std::size_t most) override;
   Result<Done, FileFailure> replace(const std::string& path, std::string_view bytes, unsigned mode) override;
   Result<Done, FileFailure> rename(const std::string& from, const std::string& to) override;
   Result<Done, FileFailure> unlink(const std::string& path) override;
   Result<FileStamp, FileFailure> stamp(const std::string& path) override;
+
+ private:
+  const Ownership _ownership;
 };
 
 // Makes the directory and its parents where they are missing.
-Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode = 0755);
+Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode = 0755,
+                                          Ownership ownership = Ownership::own);
+
+// Gives an open file to the owner of the directory that it was made in. 0, or errno.
+int giveToOwnerOfDirectory(int file, const std::string& path);
 
 // Removes the files that killed replace() calls left in the directory: NAME.XXXXXXXX.new with eight
 // hexadecimal digits. Returns how many. To be called before anything else writes there.
+// Whether files can be made in the directory, which is made where it is missing: by making one and removing
+// it.
+Result<Done, FileFailure> tryWritingIn(const std::string& directory);
+
+// Removes what a replace() that was killed has left in the directory: regular files under its pattern of
+// names, NAME.XXXXXXXX.new with eight hexadecimal digits. Returns how many. Before any other writer is there.
 std::size_t removeUnfinishedFiles(const std::string& directory);
 
 }  // namespace veltrad::platform

@@ -52,6 +52,19 @@ Preferences::Found FilePreferences::lookUp(std::string_view domain, std::string_
   return found;
 }
 
+Result<Done, std::string> FilePreferences::change(std::string_view domain, std::string_view key,
+                                                  const std::optional<Value>& value) {
+  Complaints complaints;
+  auto changed = [&] {
+    Lock lock(_mutex);
+    auto written = write(domain, key, value, complaints);
+    if (written) _unstored.erase(nameOf(domain, key));
+    return written;
+  }();
+  logAll(complaints);
+  return changed;
+}
+
 std::optional<std::string> FilePreferences::textOrStore(std::string_view domain, std::string_view key,
                                                         std::string (*make)()) {
   Complaints complaints;
@@ -138,18 +151,27 @@ Result<Dictionary, FileFailure> FilePreferences::refused(const std::string& path
 
 bool FilePreferences::store(std::string_view domain, std::string_view key, const Value& value,
                             Complaints& complaints) {
+  const auto stored = write(domain, key, value, complaints);
+  if (!stored) complaints.push_back(stored.error());
+  return stored.ok();
+}
+
+Result<Done, std::string> FilePreferences::write(std::string_view domain, std::string_view key,
+                                                 const std::optional<Value>& value, Complaints& complaints) {
   const std::string path = pathOf(domain);
   auto all = read(domain, complaints);
   if (!all) {
-    complaints.push_back("Preference not stored, its file cannot be read: " + path + ", " + std::string(key));
-    return false;
+    return Failure{"Preference not stored, its file cannot be read: " + path + ", " + std::string(key)};
   }
   Dictionary changed = std::move(all).value();
-  changed.set(std::string(key), value);
+  if (value) {
+    changed.set(std::string(key), *value);
+  } else if (!changed.erase(key)) {
+    return Done();
+  }
   const auto stored = _files.replace(path, writeBinaryPropertyList(changed));
-  if (stored) return true;
-  complaints.push_back("Preference not stored: " + stored.error().description + ", " + std::string(key));
-  return false;
+  if (stored) return Done();
+  return Failure{"Preference not stored: " + stored.error().description + ", " + std::string(key)};
 }
 
 }  // namespace veltrad::platform

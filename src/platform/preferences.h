@@ -45,6 +45,10 @@ class FilePreferences final : public Preferences {
   Found lookUp(std::string_view domain, std::string_view key) override;
   std::optional<std::string> textOrStore(std::string_view domain, std::string_view key,
                                          std::string (*make)()) override;
+  // Stores the value, or takes the key away where there is none; other keys stay. The error is one line,
+  // which was not logged.
+  Result<Done, std::string> change(std::string_view domain, std::string_view key,
+                                   const std::optional<Value>& value);
 
  private:
   // Error lines, logged after the lock was released.
@@ -58,6 +62,8 @@ class FilePreferences final : public Preferences {
                                           Complaints& complaints) REQUIRES(_mutex);
   bool store(std::string_view domain, std::string_view key, const Value& value, Complaints& complaints)
       REQUIRES(_mutex);
+  Result<Done, std::string> write(std::string_view domain, std::string_view key,
+                                  const std::optional<Value>& value, Complaints& complaints) REQUIRES(_mutex);
   std::string pathOf(std::string_view domain) const;
 
   FileStore& _files;

@@ -35,7 +35,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   facts.account = making.account;
 
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
-  const auto made = std::make_shared<BackendSet>();
+  auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : storebag->backends) {
     auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot);
     if (backend) made->emplace(name, std::move(backend));

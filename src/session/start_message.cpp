@@ -1,11 +1,14 @@
 // Makes the payload of the start message.
 #include "session/start_message.h"
 
+#include "config/preference_keys.h"
+
 namespace veltrad::session {
 
 Dictionary startMessagePayload(support::DeviceIdentity& device, const support::Veltra& library,
                                platform::Preferences& preferences, platform::Locale& locale) {
-  const auto automatic = preferences.value("com.florn.timed", "TMAutomaticTimeZoneEnabled");
+  const auto automatic =
+      preferences.value(config::preference::kTimeDomain, config::preference::kAutomaticTimeZone);
   Dictionary payload{{"AutomaticTimeSet", automatic ? automatic->toBoolean().value_or(true) : true}};
   payload.setIfPresent("Locale", locale.countryCode());
   if (!device.isInternalBuild()) return payload;

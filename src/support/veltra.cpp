@@ -47,7 +47,7 @@ Result<std::string, platform::FileFailure> Veltra::publicKeyDER() const {
 
 std::optional<std::string> Veltra::getPersistentIdentifierForDNU(bool respectDNU) const {
   return _preferences.textOrStore(platform::kVeltraPreferenceDomain,
-                                  respectDNU ? "uuidRespectDNU" : "uuidOverrideDNU",
+                                  respectDNU ? kIdentifierRespectingConsent : kIdentifierOverridingConsent,
                                   platform::randomUUIDText);
 }
 

@@ -14,6 +14,10 @@ class Root;
 
 namespace veltrad::support {
 
+// Under which preferences the identifiers of this device are kept.
+inline constexpr const char* kIdentifierRespectingConsent = "uuidRespectDNU";
+inline constexpr const char* kIdentifierOverridingConsent = "uuidOverrideDNU";
+
 class Veltra {
  public:
   Veltra(platform::FileStore& files, platform::Preferences& preferences, const platform::Root& root);
@@ -24,6 +28,7 @@ class Veltra {
   Result<std::string, platform::FileFailure> statedVersion() const;
   // The bytes of the resource "publicKey" of type "der", read at each call.
   Result<std::string, platform::FileFailure> publicKeyDER() const;
+  const std::string& publicKeyPath() const { return _publicKeyPath; }
   // A UUID that persists across restarts: one for when consent is respected, another for when it is
   // overridden. Made and stored at the first use, under "uuidRespectDNU" and "uuidOverrideDNU". Absent during
   // a shortage.

@@ -22,10 +22,24 @@ inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:"
 
 // What those who look after the device ask on the control socket.
 namespace question {
+inline constexpr const char* kConfig = "config";
+inline constexpr const char* kDoctor = "doctor";
 inline constexpr const char* kMetrics = "metrics";
+inline constexpr const char* kRefresh = "refresh";
 inline constexpr const char* kSessions = "sessions";
+inline constexpr const char* kSetConfig = "setConfig";
 inline constexpr const char* kStatus = "status";
+inline constexpr const char* kUnsetConfig = "unsetConfig";
+inline constexpr const char* kVersions = "versions";
 }  // namespace question
+
+// The checks of `veltractl doctor`, in their order. The first one is veltractl's own, the daemon decides the
+// others.
+namespace check {
+inline constexpr const char* kNames[] = {
+    "daemon",      "entitlement", "storebagAddress", "nameResolution", "trust",   "storebag",    "signature",
+    "environment", "clientTypes", "consent",         "messageLog",     "sandbox", "descriptors", "clock"};
+}  // namespace check
 
 // What the daemon calls.
 namespace event {

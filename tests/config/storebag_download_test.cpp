@@ -23,6 +23,7 @@ const std::string kMissing = "3 " + kAt + "Signature is missing";
 const std::string kNotVerified = "3 " + kAt + "Signature can not be verified, 0x";
 
 using Kind = config::StorebagAnswer::Kind;
+using Cause = config::StorebagCause;
 
 // One call, its lines and what came of it.
 struct Fetch : config::WholeStorebagAnswer {
@@ -82,24 +83,28 @@ TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
     return formats::writeXMLPropertyList(
         Dictionary{{"signature", std::move(sign)}, {"bag", std::move(content)}});
   };
-  const std::pair<std::string, Lines> table[] = {
-      {"", {kNoList, kMissing}},  // current only to one who holds a copy
-      {"<html>Not Found</html>", {kNoList, kMissing}},
-      {formats::writeXMLPropertyList(Array{}), {kMissing}},
-      {list(7, bagText), {kMissing}},
-      {list("a", bagText), {}},
-      {list(signature, 7), {}},
-      {list(signature, "a"), {}},
-      {list("", bagText), {kNotVerified}},
-      {list(signature, encodeBase64(bag + " ")), {kNotVerified}},
-      {container("signed, but no list"), {}},
-      {container(formats::writeXMLPropertyList(Array{})), {}}};
-  for (const auto& [body, lines] : table) {
+  const std::tuple<std::string, Lines, Cause, std::optional<bool>> table[] = {
+      // Current only to one who holds a copy.
+      {"", {kNoList, kMissing}, Cause::noStorebag, {}},
+      {"<html>Not Found</html>", {kNoList, kMissing}, Cause::noStorebag, {}},
+      {formats::writeXMLPropertyList(Array{}), {kMissing}, Cause::signature, false},
+      {list(7, bagText), {kMissing}, Cause::signature, false},
+      {list("a", bagText), {}, Cause::signature, false},
+      {list(signature, 7), {}, Cause::signature, false},
+      {list(signature, "a"), {}, Cause::signature, false},
+      {list("", bagText), {kNotVerified}, Cause::signature, false},
+      {list(signature, encodeBase64(bag + " ")), {kNotVerified}, Cause::signature, false},
+      {container("signed, but no list"), {}, Cause::content, true},
+      {container(formats::writeXMLPropertyList(Array{})), {}, Cause::content, true}};
+  for (const auto& [body, lines, cause, genuine] : table) {
     Configuration configuration;
     configuration.answers(body, {{"Last-Modified", kTuesday}, {"Cache-Control", "max-age=600"}});
     SCOPED_TRACE(body);
     const Fetch fetch(configuration, lines);
     EXPECT_EQ(fetch.kind, Kind::failed);
+    EXPECT_EQ(fetch.cause, cause);
+    EXPECT_EQ(fetch.genuine, genuine);
+    EXPECT_FALSE(fetch.why.empty());
     EXPECT_EQ(fetch.maxAge, 600);
     EXPECT_EQ(fetch.lastModified, kTuesday);
   }

@@ -31,9 +31,14 @@ struct Source final : config::StorebagSource {
     if (std::exchange(lacksMemory, false)) throw std::bad_alloc();
     conditional = lastModified;
     const Kind kind = section ? Kind::fetched : answersNotModified ? Kind::notModified : Kind::failed;
-    return {{kind, attempts, age, newLastModified.empty() ? lastModified : newLastModified},
-            section,
-            "v" + std::to_string(fetches)};
+    config::StorebagSectionAnswer answer;
+    answer.kind = kind;
+    answer.attempted = attempts;
+    answer.maxAge = age;
+    answer.lastModified = newLastModified.empty() ? lastModified : newLastModified;
+    answer.section = section;
+    answer.version = "v" + std::to_string(fetches);
+    return answer;
   }
   void waitForFetches(int count) {
     std::unique_lock held(mutex);

@@ -52,7 +52,7 @@ class Shortage(SystemTest):
 
     def test_files_are_read_again_after_a_shortage(self):
         """Preferences, device properties, deployment, environment and key, none of which was read before."""
-        with self.serving("the device's identifiers") as daemon:
+        with self.serving("the device's identifiers", "until the settings can be read") as daemon:
             client = Wire(self.root)
             client.describe()
             self.limit(daemon, 0)

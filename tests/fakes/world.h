@@ -18,6 +18,7 @@
 
 namespace veltrad {
 
+// Its 18 fields are the services in the order in which they need each other.
 struct World {
   FakeHTTPClient http;
   FakeClock clock;

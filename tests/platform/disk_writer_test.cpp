@@ -13,7 +13,7 @@
 #include "formats/json.h"
 #include "platform/child_process.h"
 #include "platform/counters.h"
-#include "platform/counters_file.h"
+#include "platform/state_file.h"
 
 namespace veltrad::platform {
 namespace {
@@ -70,12 +70,14 @@ TEST(DiskWriter, AThreadThatCannotBeStartedIsStartedByALaterJob) {
   EXPECT_EQ(child.said, "no thread\nwritten\n");
 }
 
-TEST(CountersFile, AreWrittenWhenTheyChangedAndAgainAfterAFailure) {
+TEST(StateFile, IsWrittenWhenTheStateChangedAndAgainAfterAFailure) {
   RecordedLog log;
   FakeFileStore files;
   platform::Counters counters;
   platform::DiskWriter writer;
-  platform::CountersFile file(counters, files, writer, "/run/c", 1'700'000'000.5);
+  platform::StateFile file({"The counters", [&] { return platform::StateFile::Version{counters.total()}; },
+                            [&] { return counters.json(1'700'000'000.5); }},
+                           files, writer, "/run/c");
   const auto written = [&] {
     EXPECT_TRUE(file.writeSoon());
     EXPECT_TRUE(writer.drain(soon()));

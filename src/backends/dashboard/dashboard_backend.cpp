@@ -85,8 +85,8 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     return nullptr;
   }
   const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period};
-  const auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind,
-                                                        making.account, making.queues, making.counters);
+  auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
+                                                  making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
     logError("DashboardBackend(useReliableUDP): can't create read source");
   }

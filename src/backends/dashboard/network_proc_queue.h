@@ -29,6 +29,8 @@ class WorkPool;
 // until nothing waits, the last resort is due, or end() is called; the socket is closed then. Waiting
 // datagrams are charged to the user, and so is the socket once it outlives the back ends. `counters` must
 // outlive the queue.
+//
+// Its 13 fields are the socket, what waits for it and what wakes it up; they end together, under one lock.
 class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQueue> {
  public:
   struct Kind {

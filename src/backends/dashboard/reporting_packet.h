@@ -10,7 +10,7 @@ namespace veltrad::backends {
 
 // Numbers are big-endian. `versionMajor` is the client library's; `componentType` is the low byte of the
 // client type; `timeFraction` is in units of 4 ms, `seconds` since 1970; `invertedLength` is the datagram's;
-// `deviceID` is padded with NUL.
+// `deviceID` is padded with NUL. Its 13 fields are those of the datagram.
 struct tagReportingPacketHeader {
   std::uint8_t versionMajor;
   std::uint8_t componentType;

@@ -4,6 +4,7 @@
 #include <string_view>
 
 #include "backends/session_facts.h"
+#include "config/preference_keys.h"
 #include "platform/log.h"
 #include "platform/uuid.h"
 
@@ -11,7 +12,7 @@ namespace veltrad::backends {
 
 namespace {
 bool diagnosticLogSubmissionEnabled(platform::Preferences& preferences) {
-  const auto consent = preferences.value(platform::kVeltraPreferenceDomain, "DiagnosticLogSubmissionEnabled");
+  const auto consent = preferences.value(platform::kVeltraPreferenceDomain, config::preference::kConsent);
   return consent && consent->toBoolean().value_or(false);
 }
 
@@ -31,8 +32,8 @@ PostIdentity::PostIdentity(const Sources& sources)
     : _preferences(sources.preferences),
       _settings(sources.settings),
       _dnuEnabled(diagnosticLogSubmissionEnabled(_preferences)),
-      _forceEventLogging(
-          textMeansYes(_preferences.text(platform::kVeltraPreferenceDomain, "forceEventLogging"))),
+      _forceEventLogging(textMeansYes(
+          _preferences.text(platform::kVeltraPreferenceDomain, config::preference::kForceEventLogging))),
       _uuidRespectDnu(sources.library.getPersistentIdentifierForDNU(true).value_or("")),
       _uuidOverrideDnu(sources.library.getPersistentIdentifierForDNU(false).value_or("")) {}
 

@@ -1,13 +1,15 @@
 // Reads post URLs from the preferences and from client entries.
 #include "backends/https/post_links.h"
 
+#include "config/preference_keys.h"
 #include "platform/log.h"
 
 namespace veltrad::backends {
 
 PostLinks::PostLinks(platform::Preferences& preferences)
-    : _postURL(preferences.text(platform::kVeltraPreferenceDomain, "httpsPostURL")),
-      _realtimePostURL(preferences.text(platform::kVeltraPreferenceDomain, "httpsRealtimePostURL")),
+    : _postURL(preferences.text(platform::kVeltraPreferenceDomain, config::preference::kPostURL)),
+      _realtimePostURL(
+          preferences.text(platform::kVeltraPreferenceDomain, config::preference::kRealtimePostURL)),
       _useDefaultPostURL(_postURL),
       _useDefaultRealtimePostURL(_realtimePostURL) {
   if (_postURL)

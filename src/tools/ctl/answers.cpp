@@ -12,18 +12,9 @@ std::string quoted(std::string_view text) {
   return formats::writeJSON(Value(text));
 }
 
-std::string formatReply(const std::optional<std::string>& reply) {
-  return reply ? quoted(*reply) : "null";
-}
-
-std::string formatBackends(const std::optional<std::vector<std::string>>& backends) {
-  if (!backends) return "null";
-  std::string text = "[";
-  for (const std::string& name : *backends) {
-    if (text.size() > 1) text += ',';
-    text += quoted(name);
-  }
-  return text + ']';
+template <typename T>
+std::string orNull(const std::optional<T>& value) {
+  return value ? formats::writeJSON(Value(*value)) : "null";
 }
 
 std::string formatError(const std::optional<wire::ReportingError>& error) {
@@ -47,14 +38,14 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
     case Operation::start:
     case Operation::restart:
     case Operation::states:
-      text += ",\"backends\":" + formatBackends(answer.backends);
+      text += ",\"backends\":" + orNull(answer.backends);
       break;
     case Operation::send:
     case Operation::oneShot:
     case Operation::flush:
     case Operation::displayURL:
     case Operation::finish:
-      text += ",\"reply\":" + formatReply(answer.reply);
+      text += ",\"reply\":" + orNull(answer.reply);
       break;
     case Operation::uploadFile:
     case Operation::uploadLogData:
@@ -69,9 +60,6 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
 }
 
 std::string formatAggregated(const AggregatedCopy& copy) {
-  const auto orNull = [](const std::optional<Dictionary>& dictionary) {
-    return dictionary ? formats::writeJSON(*dictionary) : std::string("null");
-  };
   return fmt::format(
       R"({{"op":"aggregated","sessionInfo":{},"timestamp":{},"category":{},"type":{},"payload":{}}})",
       orNull(copy.sessionInfo), formats::writeJSON(copy.timestamp), copy.category, copy.type,

@@ -5,7 +5,6 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <vector>
 
 #include "base/value.h"
 #include "tools/ctl/operation.h"
@@ -18,7 +17,7 @@ struct Answer {
   // Unless it is VELTRA_OK, the call ended without an answer, and `error` says why.
   veltra_status status = VELTRA_OK;
   std::optional<std::string> reply;
-  std::optional<std::vector<std::string>> backends;
+  std::optional<Array> backends;  // names
   std::optional<wire::ReportingError> error;
   bool uploaded = false;
   // The uploaded file was removed.

@@ -7,21 +7,22 @@
 #include <cerrno>
 #include <cstring>
 
-#include "tools/ctl/veltra_values.h"
+#include "client/value_node.h"
 
 namespace veltrad::ctl {
 namespace {
 
 constexpr std::chrono::milliseconds kProgressInterval{500};
 
-std::vector<std::string> textsOf(const veltra_value* array) {
-  std::vector<std::string> texts;
-  for (std::size_t index = 0; index < veltra_count(array); ++index) {
-    std::size_t length = 0;
-    const char* text = veltra_get_string(veltra_array_item(array, index), &length);
-    if (text) texts.emplace_back(text, length);
-  }
-  return texts;
+// Null for no dictionary.
+client::ValuePointer nodeOf(const std::optional<Dictionary>& dictionary) {
+  return dictionary ? client::nodeOfDictionary(*dictionary) : nullptr;
+}
+
+// Nothing if it is not a dictionary.
+std::optional<Dictionary> dictionaryOf(const veltra_value* value) {
+  if (veltra_type_of(value) != VELTRA_TYPE_DICTIONARY) return std::nullopt;
+  return client::dictionaryOfNode(value);
 }
 
 Answer answerOf(const veltra_reply* reply) {
@@ -29,7 +30,9 @@ Answer answerOf(const veltra_reply* reply) {
   answer.status = veltra_reply_status(reply);
   std::size_t length = 0;
   if (const char* text = veltra_reply_text(reply, &length)) answer.reply.emplace(text, length);
-  if (const veltra_value* backends = veltra_reply_backends(reply)) answer.backends = textsOf(backends);
+  if (const veltra_value* backends = veltra_reply_backends(reply)) {
+    answer.backends = client::valueOfNode(*backends).takeArray();
+  }
   answer.uploaded = veltra_reply_uploaded(reply);
   answer.removed = veltra_reply_removed(reply);
   const char* domain = veltra_reply_error_domain(reply);
@@ -41,7 +44,7 @@ Answer answerOf(const veltra_reply* reply) {
 }
 
 // Borrows `userInfo`.
-veltra_session_options optionsOf(const Identity& identity, const VeltraValue& userInfo) {
+veltra_session_options optionsOf(const Identity& identity, const client::ValuePointer& userInfo) {
   veltra_session_options options;
   veltra_session_options_init(&options);
   options.has_client_type = identity.clientType.has_value();
@@ -69,7 +72,7 @@ ClientSession::~ClientSession() {
 
 std::optional<std::string> ClientSession::open(const std::optional<std::string>& root,
                                                const Identity& identity) {
-  const VeltraValue userInfo = toVeltraValue(identity.userInfo);
+  const auto userInfo = nodeOf(identity.userInfo);
   veltra_session_options options = optionsOf(identity, userInfo);
   options.aggregated = _aggregated ? &ClientSession::aggregated : nullptr;
   options.aggregated_context = this;
@@ -104,7 +107,7 @@ std::optional<Answer> ClientSession::start() {
 }
 
 std::optional<Answer> ClientSession::send(const Dictionary& message) {
-  const VeltraValue value = toVeltraValue(Value(message));
+  const auto value = client::nodeOfDictionary(message);
   return await([&value](veltra_session* session, veltra_callback callback, void* context) {
     return veltra_session_send_dictionary(session, value.get(), callback, context);
   });
@@ -112,7 +115,7 @@ std::optional<Answer> ClientSession::send(const Dictionary& message) {
 
 std::optional<Answer> ClientSession::send(std::uint16_t category, std::uint16_t type,
                                           const std::optional<Dictionary>& payload, std::uint32_t flag) {
-  const VeltraValue value = toVeltraValue(payload);
+  const auto value = nodeOf(payload);
   return await([&](veltra_session* session, veltra_callback callback, void* context) {
     return veltra_session_send(session, category, type, value.get(), flag, callback, context);
   });
@@ -121,9 +124,9 @@ std::optional<Answer> ClientSession::send(std::uint16_t category, std::uint16_t 
 std::optional<Answer> ClientSession::sendOneShot(const Identity& who, std::uint16_t category,
                                                  std::uint16_t type,
                                                  const std::optional<Dictionary>& payload) {
-  const VeltraValue userInfo = toVeltraValue(who.userInfo);
+  const auto userInfo = nodeOf(who.userInfo);
   const veltra_session_options options = optionsOf(who, userInfo);
-  const VeltraValue value = toVeltraValue(payload);
+  const auto value = nodeOf(payload);
   return await([&](veltra_session* session, veltra_callback callback, void* context) {
     return veltra_session_send_one_shot(session, &options, category, type, value.get(), callback, context);
   });
@@ -134,7 +137,7 @@ std::optional<Answer> ClientSession::flush() {
 }
 
 std::optional<Answer> ClientSession::states(const std::optional<Dictionary>& userInfo) {
-  const VeltraValue value = toVeltraValue(userInfo);
+  const auto value = nodeOf(userInfo);
   return await([&value](veltra_session* session, veltra_callback callback, void* context) {
     return veltra_session_states(session, value.get(), callback, context);
   });
@@ -153,7 +156,7 @@ std::optional<Answer> ClientSession::uploadFile(const std::string& path, const P
 }
 
 std::optional<Answer> ClientSession::uploadLogData(const Array& data) {
-  const VeltraValue value = toVeltraValue(Value(data));
+  const auto value = client::nodeOfValue(data);
   return await([&value](veltra_session* session, veltra_callback callback, void* context) {
     return veltra_session_upload_log_data(session, value.get(), callback, context);
   });

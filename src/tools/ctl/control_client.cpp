@@ -2,10 +2,7 @@
 #include "tools/ctl/control_client.h"
 
 #include <fmt/format.h>
-#include <poll.h>
 #include <sys/socket.h>
-
-#include <cerrno>
 
 #include "base/property_list.h"
 #include "wire/error.h"
@@ -52,28 +49,11 @@ Result<Dictionary, std::string> ControlClient::ask(const char* question, Diction
 
 std::optional<Dictionary> ControlClient::reply(std::chrono::steady_clock::time_point deadline) {
   wire::Frame frame;
-  for (;;) {
-    switch (_daemon.reader.next(frame)) {
-      case wire::FrameReader::Next::frame: {
-        auto parsed = parseBinaryPropertyList(frame.body, wire::kDaemonFrameLimits);
-        if (frame.header.kind == wire::FrameKind::event) continue;
-        return parsed ? std::move(parsed.value()).takeDictionary() : std::nullopt;
-      }
-      case wire::FrameReader::Next::impossible:
-        return std::nullopt;
-      case wire::FrameReader::Next::needMore:
-        break;
-    }
-    const auto left =
-        std::chrono::ceil<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now()).count();
-    if (left <= 0) return std::nullopt;
-    pollfd watched{_daemon.socket.get(), POLLIN, 0};
-    if (::poll(&watched, 1, static_cast<int>(left)) <= 0) continue;  // the clock decides
-    const auto [bytes, room] = _daemon.reader.room();
-    const ssize_t count = ::recv(_daemon.socket.get(), bytes, room, MSG_DONTWAIT);
-    if (count > 0) _daemon.reader.received(static_cast<std::size_t>(count));
-    if (count == 0 || (count < 0 && errno != EAGAIN && errno != EINTR)) return std::nullopt;
-  }
+  do {
+    if (client::receiveFrame(_daemon, deadline, frame) != client::Received::frame) return std::nullopt;
+  } while (frame.header.kind == wire::FrameKind::event);
+  auto parsed = parseBinaryPropertyList(frame.body, wire::kDaemonFrameLimits);
+  return parsed ? std::move(parsed.value()).takeDictionary() : std::nullopt;
 }
 
 }  // namespace veltrad::ctl

@@ -1,7 +1,11 @@
 // veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
 
+#include "tools/ctl/config_command.h"
+#include "tools/ctl/doctor_command.h"
 #include "tools/ctl/options.h"
+#include "tools/ctl/refresh_command.h"
+#include "tools/ctl/report_command.h"
 #include "tools/ctl/send_command.h"
 #include "tools/ctl/session_command.h"
 #include "tools/ctl/stats_command.h"
@@ -22,8 +26,19 @@ int main(int argc, char** argv) {
       return runStats(options);
     case Command::status:
       return runStatus(options, interrupt);
+    case Command::doctor:
+      return runDoctor(options);
     case Command::metrics:
       return runMetrics(options);
+    case Command::config:
+    case Command::configGet:
+    case Command::configSet:
+    case Command::configUnset:
+      return runConfig(options);
+    case Command::refresh:
+      return runRefresh(options);
+    case Command::report:
+      return runReport(options);
     case Command::session:
       return runSession(options, interrupt);
     default:

@@ -19,8 +19,8 @@ namespace {
 
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
-    "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status or "
-    "metrics";
+    "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
+    "metrics, doctor, config, refresh or report";
 
 // Arguments in text form.
 struct Texts {
@@ -118,7 +118,10 @@ class Help : public CLI::Formatter {
   }
   std::string make_option_name(const CLI::Option* option, bool positional) const override {
     if (!positional) return Formatter::make_option_name(option, positional);
-    return option->get_name() == "payload" ? "KEY=VALUE" : "FILE";
+    std::string name = option->get_name();
+    if (name == "payload") return "KEY=VALUE";
+    for (char& c : name) c = static_cast<char>(c - 'a' + 'A');
+    return name;
   }
 };
 
@@ -183,17 +186,107 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
   url->footer("Example:\n  veltractl display-url --client-type 7");
 }
 
+constexpr const char* kCareGroup = "Looking after a device";
+void addDoctor(CLI::App& app, Options& options, const char* group) {
+  CLI::App* doctor = addCommand(app, options, Command::doctor, "doctor",
+                                "Check everything that stands between this device and its first report")
+                         ->group(group);
+  const auto add = [&options](const std::string& text) {
+    std::int32_t type = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), type);
+    if (error != std::errc() || end != text.data() + text.size() || type < 0) {
+      throw CLI::ValidationError(
+          "--client-type", fmt::format("expected a client type, 0 to 17, found \"{}\"", escapedForLog(text)));
+    }
+    options.care.clientTypes.push_back(type);
+  };
+  doctor
+      ->add_option_function<std::vector<std::string>>(
+          "--client-type",
+          [add](const std::vector<std::string>& texts) {
+            for (const std::string& text : texts) add(text);
+          },
+          "Look at this client type's storebag; repeat the option for more. Without it at those that\n"
+          "sessions have asked for since the start, else at all")
+      ->type_name("N");
+  doctor->footer(
+      "Prints each check with ok, warning, failure or skipped, and what to do. The exit status is 1 exactly "
+      "if\n"
+      "there is a failure. Storebags are fetched anew, and what comes is used for nothing else.\n\n"
+      "Examples:\n  veltractl doctor\n  veltractl doctor --client-type 7 --json");
+}
+
 // For those who look after a device.
+void addConfig(CLI::App& app, Options& options) {
+  Care& care = options.care;
+  CLI::App* config = addCommand(app, options, Command::config, "config",
+                                "Show or change the preferences that the system reads")
+                         ->group(kCareGroup);
+  // A command's callback runs before that of the command which it belongs to.
+  config->final_callback([&options, config] {
+    if (config->get_subcommands().empty()) options.command = Command::config;
+  });
+  config->require_subcommand(0, 1);
+  const auto addKey = [&](CLI::App* command) {
+    command->add_option("key", care.key, "Name of a preference, as `veltractl config` shows it")
+        ->type_name("")
+        ->required();
+  };
+  addKey(addCommand(*config, options, Command::configGet, "get", "Print the value alone"));
+  CLI::App* set = addCommand(*config, options, Command::configSet, "set", "Store a value");
+  addKey(set);
+  set->add_option("value", care.value, "true, false, a number, or a text, as the key's type says")
+      ->type_name("")
+      ->required();
+  addKey(addCommand(*config, options, Command::configUnset, "unset",
+                    "Take a value away; the default holds again"));
+  config->footer(
+      "Without a command, all preferences are shown. While no daemon runs, their files are read and written\n"
+      "directly. The exit status of get is 1 where the key is not set; a wrong key or value is a usage "
+      "error.\n\n"
+      "Examples:\n  veltractl config set DiagnosticLogSubmissionEnabled true\n"
+      "  veltractl config get com.florn.timed/TMAutomaticTimeZoneEnabled");
+}
+
+void addRefreshAndReport(CLI::App& app, Options& options) {
+  CLI::App* refresh =
+      addCommand(app, options, Command::refresh, "refresh", "Fetch storebags now and say what came of it")
+          ->group(kCareGroup);
+  refresh
+      ->add_option("name", options.care.key,
+                   "A storebag; without it those asked for since the start, else all")
+      ->type_name("");
+  refresh->footer(
+      "Asks the server also when the last attempt has just failed, and never \"only if modified\". The exit\n"
+      "status is 1 if a storebag was not fetched.\n\nExamples:\n  veltractl refresh\n"
+      "  veltractl refresh quindle --json");
+  CLI::App* report = addCommand(app, options, Command::report, "report",
+                                "Print all that helps to find a fault, to be passed on")
+                         ->group(kCareGroup);
+  report->add_option("-o,--output", options.care.output, "Also write it to FILE, a new one, mode 0600")
+      ->type_name("FILE");
+  report->add_flag("--yes", options.care.yes, "Write it without a question");
+  report->footer(
+      "Status, checks, counters, configuration, versions and the last lines of the log. Secrets, "
+      "identifiers,\n"
+      "names of people and their addresses are left out; read it before you pass it on.\n"
+      "With --output it is shown first, and then asked whether to write it; without a terminal to ask on,\n"
+      "--yes is required.\n\nExample:\n  veltractl report --output veltra-report.txt");
+}
+
 void addObservation(CLI::App& app, Options& options) {
-  const char* group = "Looking after a device";
+  const char* group = kCareGroup;
   CLI::App* status = addCommand(app, options, Command::status, "status",
                                 "Show the running daemon, its sessions, storebags and servers")
                          ->group(group);
-  status->add_flag("--watch", options.watch, "Show it anew every second, until interrupted");
+  status->add_flag("--watch", options.care.watch, "Show it anew every second, until interrupted");
   status->footer("Examples:\n  veltractl status --watch\n  veltractl status --json");
   addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text")
       ->group(group)
       ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
+  addConfig(app, options);
+  addRefreshAndReport(app, options);
+  addDoctor(app, options, group);
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
                                "Show what happened to messages, by reason, with counts")
                         ->group(group);
@@ -227,7 +320,8 @@ void addGlobals(CLI::App& app, Options& options) {
       ->check(CLI::Validator(
           [](const std::string& text) { return text.empty() ? "expected a directory, found nothing" : ""; },
           ""));
-  app.add_flag("--json", options.json, "Print status and stats as JSON; what opens a session always does");
+  app.add_flag("--json", options.json,
+               "Print status, stats and doctor as JSON; what opens a session always does");
   app.set_version_flag("--version", fmt::format("veltractl {}", veltra_version()), "Print the version");
   app.set_help_flag("-h,--help", "Print this help");
   app.require_subcommand(1);

@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <variant>
+#include <vector>
 
 #include "base/value.h"
 #include "tools/command_line.h"
@@ -32,7 +33,27 @@ enum class Command {
   uploadLogData,
   stats,
   status,
-  metrics
+  metrics,
+  doctor,
+  config,
+  configGet,
+  configSet,
+  configUnset,
+  refresh,
+  report
+};
+
+// Of the commands for those who look after a device.
+struct Care {
+  bool watch = false;
+  // doctor.
+  std::vector<std::int32_t> clientTypes;
+  // config: a preference's name; refresh: a storebag's, empty for all.
+  std::string key;
+  std::string value;
+  // report: the file to write.
+  std::optional<std::string> output;
+  bool yes = false;
 };
 
 // The command's options and arguments, by name.
@@ -48,7 +69,7 @@ struct Options {
   std::uint32_t flag = 0;
   std::optional<Dictionary> payload;
   std::string file;
-  bool watch = false;
+  Care care;
 };
 
 // What to print instead of running: help, version, or what is wrong with the command line. The status is 2

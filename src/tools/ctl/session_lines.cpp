@@ -15,79 +15,85 @@ namespace {
 constexpr const char* kExpectedOperations =
     "expected one of send, flush, states, displayURL, uploadFile, uploadLogData, restart, sleep, finish";
 
-// Says what is wrong with the field, unless it is absent or an object.
-std::optional<std::string> objectProblem(Operation operation, const Dictionary& line, const char* key) {
-  const Value* value = line.find(key);
-  if (!value || value->asDictionary()) return std::nullopt;
-  return fmt::format("\"{}\" of {}: expected an object, found {}", key, operationName(operation),
-                     typeName(*value));
+// What is wrong with a line, if anything is.
+using Problem = std::optional<std::string>;
+
+Problem notOfType(const char* key, Operation operation, const char* expected, const Value& found) {
+  return fmt::format("\"{}\" of {}: expected {}, found {}", key, operationName(operation), expected,
+                     typeName(found));
 }
 
 bool isInteger(const Value& value) {
   return value.type() == Value::Type::signedInteger || value.type() == Value::Type::unsignedInteger;
 }
 
-Result<SessionLine, std::string> parseSend(Dictionary line) {
-  if (auto problem = objectProblem(Operation::send, line, wire::kVeltraMessageParametersPayload))
-    return Failure{*problem};
+Problem readSend(const Dictionary& line, SessionLine& result) {
+  const Value* payload = line.find(wire::kVeltraMessageParametersPayload);
+  if (payload && !payload->asDictionary()) {
+    return notOfType(wire::kVeltraMessageParametersPayload, Operation::send, "an object", *payload);
+  }
   const Value* flag = line.find(wire::kVeltraMessageParametersFlag);
   if (flag && !isInteger(*flag)) {
-    return Failure{fmt::format("\"flag\" of send: expected an integer, found {}", typeName(*flag))};
+    return notOfType(wire::kVeltraMessageParametersFlag, Operation::send, "an integer", *flag);
   }
-  SessionLine result;
-  result.operation = Operation::send;
-  line.erase("op");
-  result.message = std::move(line);
-  return result;
+  result.message = line;
+  result.message.erase("op");
+  return std::nullopt;
 }
 
-Result<SessionLine, std::string> parseStates(const Dictionary& line) {
-  if (auto problem = objectProblem(Operation::states, line, "userInfo")) return Failure{*problem};
-  SessionLine result;
-  result.operation = Operation::states;
-  if (const Dictionary* userInfo = line.dictionary("userInfo")) result.userInfo = *userInfo;
-  return result;
+Problem readStates(const Dictionary& line, SessionLine& result) {
+  const Value* userInfo = line.find("userInfo");
+  if (!userInfo) return std::nullopt;
+  if (!userInfo->asDictionary()) return notOfType("userInfo", Operation::states, "an object", *userInfo);
+  result.userInfo = *userInfo->asDictionary();
+  return std::nullopt;
 }
 
-Result<SessionLine, std::string> parseUploadFile(const Dictionary& line) {
+Problem readUploadFile(const Dictionary& line, SessionLine& result) {
   const Value* path = line.find("path");
-  if (!path) return Failure{std::string("no \"path\" in uploadFile: expected a text")};
-  const std::string* text = path->asString();
-  if (!text)
-    return Failure{fmt::format("\"path\" of uploadFile: expected a text, found {}", typeName(*path))};
-  if (text->find('\0') != std::string::npos)
-    return Failure{std::string("\"path\" of uploadFile holds a NUL character: expected none")};
-  SessionLine result;
-  result.operation = Operation::uploadFile;
-  result.path = *text;
-  return result;
+  if (!path) return "no \"path\" in uploadFile: expected a text";
+  if (!path->asString()) return notOfType("path", Operation::uploadFile, "a text", *path);
+  result.path = *path->asString();
+  if (result.path.find('\0') == std::string::npos) return std::nullopt;
+  return "\"path\" of uploadFile holds a NUL character: expected none";
 }
 
-Result<SessionLine, std::string> parseUploadLogData(const Dictionary& line) {
+Problem readUploadLogData(const Dictionary& line, SessionLine& result) {
   const Value* data = line.find("data");
-  if (!data) return Failure{std::string("no \"data\" in uploadLogData: expected an array")};
-  const Array* array = data->asArray();
-  if (!array)
-    return Failure{fmt::format("\"data\" of uploadLogData: expected an array, found {}", typeName(*data))};
-  SessionLine result;
-  result.operation = Operation::uploadLogData;
-  result.data = *array;
-  return result;
+  if (!data) return "no \"data\" in uploadLogData: expected an array";
+  if (!data->asArray()) return notOfType("data", Operation::uploadLogData, "an array", *data);
+  result.data = *data->asArray();
+  return std::nullopt;
 }
 
-Result<SessionLine, std::string> parseSleep(const Dictionary& line) {
+Problem readSleep(const Dictionary& line, SessionLine& result) {
   const std::string expected = fmt::format("expected an integer from 0 to {}", kLongestSleep.count());
   const Value* ms = line.find("ms");
-  if (!ms) return Failure{fmt::format("no \"ms\" in sleep: {}", expected)};
+  if (!ms) return fmt::format("no \"ms\" in sleep: {}", expected);
   const auto count = isInteger(*ms) ? ms->toInt64() : std::nullopt;
-  if (!count) return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, typeName(*ms))};
+  if (!count) return fmt::format("\"ms\" of sleep: {}, found {}", expected, typeName(*ms));
   if (*count < 0 || *count > kLongestSleep.count()) {
-    return Failure{fmt::format("\"ms\" of sleep: {}, found {}", expected, formats::writeJSON(*ms))};
+    return fmt::format("\"ms\" of sleep: {}, found {}", expected, formats::writeJSON(*ms));
   }
-  SessionLine result;
-  result.operation = Operation::sleep;
   result.duration = std::chrono::milliseconds(*count);
-  return result;
+  return std::nullopt;
+}
+
+Problem readFields(const Dictionary& line, SessionLine& result) {
+  switch (result.operation) {
+    case Operation::send:
+      return readSend(line, result);
+    case Operation::states:
+      return readStates(line, result);
+    case Operation::uploadFile:
+      return readUploadFile(line, result);
+    case Operation::uploadLogData:
+      return readUploadLogData(line, result);
+    case Operation::sleep:
+      return readSleep(line, result);
+    default:
+      return std::nullopt;
+  }
 }
 
 Result<Operation, std::string> operationOf(const Dictionary& line) {
@@ -124,22 +130,9 @@ Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
   if (!operation) return Failure{operation.error()};
   if (hasUnsendableKey(json.value()))
     return Failure{std::string("a key holds a NUL character: expected none")};
-  switch (operation.value()) {
-    case Operation::send:
-      return parseSend(*fields);
-    case Operation::states:
-      return parseStates(*fields);
-    case Operation::uploadFile:
-      return parseUploadFile(*fields);
-    case Operation::uploadLogData:
-      return parseUploadLogData(*fields);
-    case Operation::sleep:
-      return parseSleep(*fields);
-    default:
-      break;
-  }
   SessionLine result;
   result.operation = operation.value();
+  if (auto problem = readFields(*fields, result)) return Failure{*problem};
   return result;
 }
 

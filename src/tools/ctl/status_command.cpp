@@ -19,6 +19,28 @@ namespace {
 
 constexpr std::chrono::seconds kRedraw{1};
 
+std::string printed(const Options& options, const Dictionary& status) {
+  if (options.json) return formats::writeJSON(status);
+  const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
+  return formatStatus(status, now.count());
+}
+
+bool printStatus(const Options& options, bool redraw) {
+  const auto status = askForStatus(options);
+  std::string text = status ? printed(options, status.value()) : std::string();
+  if (!redraw && !status) complain(status.error());
+  if (!redraw) return status && printLine(text);
+  // The cursor to the top, each line to its end and then the rest of the screen cleared: nothing flickers.
+  std::string screen = "\033[H";
+  for (const char c : status ? text : "veltractl: " + status.error()) {
+    if (c == '\n') screen += "\033[K";
+    screen += c;
+  }
+  return printLine(screen + "\033[K\033[J");
+}
+
+}  // namespace
+
 Result<Dictionary, std::string> askForStatus(const Options& options) {
   auto client = ControlClient::connect(options.root);
   if (!client) return Failure{client.error()};
@@ -42,30 +64,8 @@ Result<Dictionary, std::string> askForStatus(const Options& options) {
   return status;
 }
 
-std::string printed(const Options& options, const Dictionary& status) {
-  if (options.json) return formats::writeJSON(status);
-  const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
-  return formatStatus(status, now.count());
-}
-
-bool printStatus(const Options& options, bool redraw) {
-  const auto status = askForStatus(options);
-  std::string text = status ? printed(options, status.value()) : std::string();
-  if (!redraw && !status) complain(status.error());
-  if (!redraw) return status && printLine(text);
-  // The cursor to the top, each line to its end and then the rest of the screen cleared: nothing flickers.
-  std::string screen = "\033[H";
-  for (const char c : status ? text : "veltractl: " + status.error()) {
-    if (c == '\n') screen += "\033[K";
-    screen += c;
-  }
-  return printLine(screen + "\033[K\033[J");
-}
-
-}  // namespace
-
 int runStatus(const Options& options, Interrupt& interrupt) {
-  if (!options.watch) return printStatus(options, false) ? 0 : 1;
+  if (!options.care.watch) return printStatus(options, false) ? 0 : 1;
   interrupt.begin();
   const bool redraw = !options.json && ::isatty(STDOUT_FILENO);
   if (redraw && !printLine("\033[2J")) return 1;

@@ -1,11 +1,18 @@
 // `veltractl status` and `veltractl metrics`. The main thread.
 #pragma once
 
+#include <string>
+
+#include "base/result.h"
+#include "base/value.h"
 #include "tools/ctl/options.h"
 
 namespace veltrad::ctl {
 
 class Interrupt;
+
+// What --json prints, or one line that says why there is nothing.
+Result<Dictionary, std::string> askForStatus(const Options& options);
 
 // Prints the status of the running daemon once, or with --watch once a second, in place on a terminal, until
 // SIGINT or SIGTERM. The exit status: 0, or 1 where the daemon did not answer.

@@ -20,7 +20,7 @@ std::optional<std::int64_t> fromHTTPDate(const std::string& text) {
 
 std::string bodyFor(const Dictionary& storebag, const config::SigningKey& key, Rule::Signature sign) {
   if (sign == Rule::Signature::right) return config::makeStorebagContainer(key, storebag);
-  const std::string bag = formats::writeXMLPropertyList(storebag);
+  std::string bag = formats::writeXMLPropertyList(storebag);
   if (sign == Rule::Signature::none) return bag;
   Dictionary container{{"bag", encodeBase64(bag)}};
   if (sign == Rule::Signature::wrong) {

@@ -10,22 +10,16 @@
 #include <cstdint>
 #include <memory>
 
+#include "base/freed.h"
 #include "platform/file_store.h"
 
 namespace veltrad::lab {
 namespace {
 
-template <auto Free>
-struct Freed {
-  template <typename T>
-  void operator()(T* held) const {
-    Free(held);
-  }
-};
-using Key = std::unique_ptr<EVP_PKEY, Freed<EVP_PKEY_free>>;
-using Certificate = std::unique_ptr<X509, Freed<X509_free>>;
-using Extension = std::unique_ptr<X509_EXTENSION, Freed<X509_EXTENSION_free>>;
-using Memory = std::unique_ptr<BIO, Freed<BIO_free>>;
+using Key = Owned<EVP_PKEY, EVP_PKEY_free>;
+using Certificate = Owned<X509, X509_free>;
+using Extension = Owned<X509_EXTENSION, X509_EXTENSION_free>;
+using Memory = Owned<BIO, BIO_free>;
 
 constexpr long kDay = 24 * 60 * 60;
 

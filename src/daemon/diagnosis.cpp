@@ -1,0 +1,375 @@
+// Each check by itself; those about the server know what was found on the way to it.
+#include "daemon/diagnosis.h"
+
+#include <fmt/chrono.h>
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <ctime>
+#include <iterator>
+
+#include "base/text.h"
+#include "base/version.h"
+#include "config/process_settings.h"
+#include "wire/constants.h"
+
+namespace veltrad::daemon {
+
+namespace {
+
+using Result = Check::Result;
+using Cause = config::StorebagCause;
+using Findings = std::vector<StorebagFinding>;
+
+Check ok(const char* name, std::string text) {
+  return {name, Result::ok, std::move(text), ""};
+}
+
+Check skipped(const char* name, std::string why) {
+  return {name, Result::skipped, std::move(why), ""};
+}
+
+Check checkEntitlement(const EntitlementFacts& facts) {
+  constexpr const char* kName = "entitlement";
+  const std::string rule =
+      fmt::format(R"({{"uid": {}, "entitlements": {{"{}": true}}}})", facts.uid, wire::kVeltraEntitlement);
+  if (!facts.rules) {
+    return {kName, Result::warning, facts.path + " cannot be read just now", "run the command again"};
+  }
+  if (facts.rules->missing) {
+    return {kName, Result::failure, fmt::format("there is no {}, so nobody may report", facts.path),
+            fmt::format("write that file: an array of rules such as {}", rule)};
+  }
+  if (!facts.rules->error.empty()) {
+    return {kName, Result::failure, facts.rules->error + "; nobody may report",
+            fmt::format("mend {}: an array of rules such as {}", facts.path, rule)};
+  }
+  if (!facts.rules->grants) {
+    const std::string why = facts.rules->warnings.empty() ? "" : ": " + facts.rules->warnings.front();
+    return {
+        kName, Result::failure,
+        fmt::format("no rule in {} grants \"{}\" to anybody{}", facts.path, wire::kVeltraEntitlement, why),
+        fmt::format("add a rule such as {}", rule)};
+  }
+  if (!facts.granted) {
+    return {kName, Result::warning,
+            fmt::format("{} grants \"{}\" to others, but not to uid {}, which asks", facts.path,
+                        wire::kVeltraEntitlement, facts.uid),
+            fmt::format("if this user is to report, add a rule such as {}", rule)};
+  }
+  return ok(kName, fmt::format("uid {} may report", facts.uid));
+}
+
+Check checkAddress(const AddressFacts& facts) {
+  constexpr const char* kName = "storebagAddress";
+  constexpr const char* kSet = "veltractl config set veltra_storebag_url https://HOST/PATH";
+  if (!facts.inUse) {
+    return {kName, Result::warning, "the storebag server's address cannot be read just now",
+            "run the command again"};
+  }
+  const std::string shown = escapedForLog(*facts.inUse);
+  const bool changed = facts.preferred && *facts.preferred != *facts.inUse;
+  if (config::isExampleStorebagURL(*facts.inUse)) {
+    if (changed) {
+      return {kName, Result::failure,
+              fmt::format("veltra_storebag_url was set after the daemon had chosen {}, a built-in example",
+                          shown),
+              "start the daemon again: systemctl restart veltrad"};
+    }
+    const std::string why = facts.deploymentProblem.empty()
+                                ? fmt::format(
+                                      "neither the preference veltra_storebag_url nor {} names a "
+                                      "storebag server",
+                                      facts.deploymentPath)
+                                : facts.deploymentProblem;
+    return {kName, Result::failure, fmt::format("{}; {} is a built-in example", why, shown),
+            fmt::format("{}, or name the host in {}; then: systemctl restart veltrad", kSet,
+                        facts.deploymentPath)};
+  }
+  if (!facts.inUse->starts_with("https://")) {
+    return {kName, Result::failure, fmt::format("\"{}\" does not begin with https://", shown),
+            fmt::format("{}; then: systemctl restart veltrad", kSet)};
+  }
+  if (changed) {
+    return {kName, Result::warning,
+            fmt::format("{} is in use, and veltra_storebag_url is now {}", shown,
+                        escapedForLog(*facts.preferred)),
+            "for the new address start the daemon again: systemctl restart veltrad"};
+  }
+  return ok(kName, shown);
+}
+
+const StorebagFinding* findingWith(const Findings& findings, Cause cause) {
+  const auto at = std::find_if(findings.begin(), findings.end(), [cause](const StorebagFinding& finding) {
+    return finding.answer.cause == cause;
+  });
+  return at == findings.end() ? nullptr : &*at;
+}
+
+bool anyAnswered(const Findings& findings) {
+  return std::any_of(findings.begin(), findings.end(),
+                     [](const StorebagFinding& finding) { return finding.answer.status != 0; });
+}
+
+// An error's page is no storebag either, but that says nothing of it.
+std::string labelled(const StorebagFinding& finding) {
+  const bool refused = finding.answer.cause == Cause::noStorebag && finding.answer.status >= 400;
+  return fmt::format(
+      "\"{}\": {}", finding.name,
+      refused ? fmt::format("HTTP {}", finding.answer.status) : escapedForLog(finding.answer.why));
+}
+
+template <typename Chosen>
+std::string listed(const Findings& findings, Chosen chosen, std::string (*label)(const StorebagFinding&)) {
+  std::string text;
+  for (const StorebagFinding& finding : findings) {
+    if (chosen(finding)) text += (text.empty() ? "" : "; ") + label(finding);
+  }
+  return text;
+}
+
+Check checkNameResolution(const Findings& findings) {
+  constexpr const char* kName = "nameResolution";
+  if (const StorebagFinding* finding = findingWith(findings, Cause::resolve)) {
+    return {kName, Result::failure, escapedForLog(finding->answer.why),
+            "see whether the host in veltra_storebag_url is right, and whether this device resolves names"};
+  }
+  if (!anyAnswered(findings) && findingWith(findings, Cause::noAttempt))
+    return skipped(kName, "no request could be made");
+  return ok(kName, "the server's name is resolved");
+}
+
+Check checkTrust(const StorebagFacts& facts, const Check& resolved) {
+  constexpr const char* kName = "trust";
+  if (resolved.result == Result::failure) return skipped(kName, "the server's name is not resolved");
+  if (const StorebagFinding* finding = findingWith(facts.findings, Cause::trust)) {
+    return {kName, Result::failure, escapedForLog(finding->answer.why),
+            fmt::format("put the certificate of the authority that signed the server's into {}, in PEM form",
+                        facts.certificatesPath)};
+  }
+  if (!anyAnswered(facts.findings)) return skipped(kName, "no connection to the server has come about");
+  return ok(kName, "the server's certificate is trusted");
+}
+
+bool isGenuine(const StorebagFinding& finding) {
+  return finding.answer.genuine.value_or(false);
+}
+
+bool isNoStorebag(const StorebagFinding& finding) {
+  return finding.answer.cause == Cause::noStorebag || finding.answer.cause == Cause::content;
+}
+
+Check checkStorebag(const StorebagFacts& facts, const std::string& address) {
+  constexpr const char* kName = "storebag";
+  const Findings& findings = facts.findings;
+  if (findingWith(findings, Cause::resolve) || findingWith(findings, Cause::trust))
+    return skipped(kName, "no storebag could be asked for");
+  const StorebagFinding& last = findings.back();
+  if (last.answer.cause == Cause::noAttempt) {
+    return {kName, Result::failure, labelled(last),
+            "run the command again, and see the check of descriptors"};
+  }
+  if (endsAtServer(last.answer.cause)) {
+    return {kName, Result::failure, labelled(last),
+            fmt::format("see whether the storebag server runs and answers at {}", address)};
+  }
+  const std::string problems = listed(findings, isNoStorebag, labelled);
+  if (problems.empty()) return ok(kName, fmt::format("{} fetched", findings.size()));
+  const std::string mend =
+      fmt::format("publish the storebag, made with `veltra-storebag sign`, under {}/NAME", address);
+  // Nobody has asked for these so far, and a fleet need not have all.
+  const bool spare =
+      !facts.needed && std::all_of(findings.begin(), findings.end(), [](const StorebagFinding& one) {
+        return !isNoStorebag(one) || one.answer.status == 404;
+      });
+  const bool some = std::any_of(findings.begin(), findings.end(), isGenuine);
+  return {kName, spare && some ? Result::warning : Result::failure, problems, mend};
+}
+
+bool isNotGenuine(const StorebagFinding& finding) {
+  return finding.answer.cause == Cause::signature || finding.answer.cause == Cause::publicKey;
+}
+
+std::string quoted(const StorebagFinding& finding) {
+  return fmt::format("\"{}\"", finding.name);
+}
+
+Check checkSignature(const StorebagFacts& facts) {
+  constexpr const char* kName = "signature";
+  if (const StorebagFinding* without = findingWith(facts.findings, Cause::publicKey)) {
+    return {kName, Result::failure, labelled(*without),
+            fmt::format("install the public key that storebags are signed for as {}", facts.publicKeyPath)};
+  }
+  const std::string bad = listed(facts.findings, isNotGenuine, quoted);
+  if (!bad.empty()) {
+    return {kName, Result::failure, listed(facts.findings, isNotGenuine, labelled),
+            fmt::format("sign {} with the private key that belongs to {}, or install the publicKey.der that "
+                        "belongs to the key it is signed with",
+                        bad, facts.publicKeyPath)};
+  }
+  const std::string good = listed(facts.findings, isGenuine, quoted);
+  if (good.empty()) return skipped(kName, "there is no storebag to verify");
+  return ok(kName, "good: " + good);
+}
+
+std::string withVersion(const StorebagFinding& finding) {
+  return finding.version ? fmt::format("\"{}\" ({})", finding.name, escapedForLog(*finding.version))
+                         : quoted(finding);
+}
+
+Check checkEnvironment(const StorebagFacts& facts) {
+  constexpr const char* kName = "environment";
+  const auto without = [](const StorebagFinding& one) { return one.answer.cause == Cause::noSection; };
+  const auto with = [](const StorebagFinding& one) { return one.answer.cause == Cause::none; };
+  const auto empty = [](const StorebagFinding& one) { return one.emptyRecord; };
+  if (const std::string missing = listed(facts.findings, without, labelled); !missing.empty()) {
+    const std::string mend =
+        facts.section ? fmt::format(
+                            "add the section \"{}\" to the storebag, or choose another environment: "
+                            "veltractl config set environmentType 1 to 4",
+                            facts.section)
+                      : "choose an environment: veltractl config set environmentType 1 to 4";
+    return {kName, Result::failure, missing, mend};
+  }
+  if (const std::string names = listed(facts.findings, empty, quoted); !names.empty()) {
+    return {kName, Result::failure,
+            fmt::format("the daemon holds {} as fetched successfully, but without a section: the server says "
+                        "\"not modified\" of a storebag that was not kept",
+                        names),
+            "fetch it whole: veltractl refresh NAME"};
+  }
+  const std::string there = listed(facts.findings, with, withVersion);
+  if (there.empty()) return skipped(kName, "there is no verified storebag to look into");
+  return ok(kName, fmt::format("section \"{}\" of {}", facts.section ? facts.section : "", there));
+}
+
+Check checkClientTypes(const StorebagFacts& facts) {
+  constexpr const char* kName = "clientTypes";
+  if (facts.typesWithout.empty()) {
+    const auto all = [](const StorebagFinding&) { return true; };
+    const std::string names = listed(facts.findings, all, quoted);
+    return ok(kName, names.empty() ? "no storebag was asked for" : "storebags asked for: " + names);
+  }
+  std::string numbers;
+  for (const std::int32_t type : facts.typesWithout)
+    numbers += (numbers.empty() ? "" : ", ") + std::to_string(type);
+  return {kName, Result::warning,
+          fmt::format("client types without a storebag, whose sessions never report: {}", numbers),
+          "use a client type from 5 to 17"};
+}
+
+Check checkConsent(Consent consent) {
+  constexpr const char* kName = "consent";
+  constexpr const char* kKey = "DiagnosticLogSubmissionEnabled";
+  constexpr const char* kGive = "veltractl config set DiagnosticLogSubmissionEnabled true";
+  switch (consent) {
+    case Consent::given:
+      return ok(kName, "given");
+    case Consent::refused:
+      return {kName, Result::warning,
+              fmt::format("refused: {} is false, so only what needs no consent is reported", kKey),
+              fmt::format("the owner's choice; to change it: {}", kGive)};
+    case Consent::neverGiven:
+      return {kName, Result::failure,
+              fmt::format("never given: {} is not set, so only what needs no consent is reported", kKey),
+              kGive};
+    case Consent::noBoolean:
+      return {kName, Result::failure, fmt::format("{} is not a boolean, which counts as refused", kKey),
+              kGive};
+    case Consent::notKnown:
+      break;
+  }
+  return {kName, Result::warning, fmt::format("{} cannot be read just now", kKey), "run the command again"};
+}
+
+Check checkMessageLog(const MachineFacts& facts) {
+  constexpr const char* kName = "messageLog";
+  if (facts.messageLogProblem.empty()) return ok(kName, facts.messageLogPath);
+  return {kName, Result::failure, facts.messageLogProblem,
+          fmt::format("make {} a directory that the daemon's user may write to, with free space",
+                      facts.messageLogPath)};
+}
+
+Check checkSandbox(const MachineFacts& facts) {
+  constexpr const char* kName = "sandbox";
+  if (facts.sandboxInForce) return ok(kName, facts.sandboxLine);
+  return {kName, Result::warning, facts.sandboxLine,
+          "use a kernel with Landlock (5.13 or newer, \"landlock\" in its lsm= list)"};
+}
+
+Check checkDescriptors(const MachineFacts& facts) {
+  constexpr const char* kName = "descriptors";
+  const std::string mend = fmt::format("in the unit of veltrad: LimitNOFILE={}", facts.descriptorsNeeded);
+  if (facts.descriptors < kFewestDescriptors) {
+    return {kName, Result::failure,
+            fmt::format("{} at most, and a daemon with a few clients needs {}", facts.descriptors,
+                        kFewestDescriptors),
+            mend};
+  }
+  if (facts.descriptors < facts.descriptorsNeeded) {
+    return {kName, Result::warning,
+            fmt::format("{} at most; for as many connections as are allowed it takes {}", facts.descriptors,
+                        facts.descriptorsNeeded),
+            mend};
+  }
+  return ok(kName, fmt::format("{} at most", facts.descriptors));
+}
+
+std::string dateOf(double secondsSince1970) {
+  const auto whole = static_cast<std::time_t>(secondsSince1970);
+  std::tm parts{};
+  gmtime_r(&whole, &parts);
+  return fmt::format("{:%Y-%m-%d %H:%M:%S} UTC", parts);
+}
+
+Check checkClock(double now) {
+  constexpr const char* kName = "clock";
+  if (now >= kEarliestTime) return ok(kName, dateOf(now));
+  return {kName, Result::failure,
+          fmt::format("{} is before this program was made, and certificates seem not valid yet", dateOf(now)),
+          "set the clock: timedatectl set-ntp true"};
+}
+
+// The checks on the way to a storebag in use.
+void diagnoseServer(const StorebagFacts& storebags, const AddressFacts& address, std::vector<Check>& checks) {
+  const bool noAddress = checks.back().result == Result::failure || !address.inUse;
+  if (noAddress || storebags.findings.empty()) {
+    const std::string why =
+        noAddress ? "there is no storebag server to ask" : "no client type that was asked for has a storebag";
+    for (const char* name : {"nameResolution", "trust", "storebag", "signature", "environment"})
+      checks.push_back(skipped(name, why));
+    return;
+  }
+  checks.push_back(checkNameResolution(storebags.findings));
+  checks.push_back(checkTrust(storebags, checks.back()));
+  checks.push_back(checkStorebag(storebags, escapedForLog(address.inUse.value_or(""))));
+  checks.push_back(checkSignature(storebags));
+  checks.push_back(checkEnvironment(storebags));
+}
+
+}  // namespace
+
+bool endsAtServer(config::StorebagCause cause) {
+  return cause == Cause::noAttempt || cause == Cause::resolve || cause == Cause::connect ||
+         cause == Cause::trust || cause == Cause::noAnswer;
+}
+
+const char* nameOf(Check::Result result) {
+  constexpr const char* kNames[] = {"ok", "warning", "failure", "skipped"};
+  return kNames[static_cast<std::size_t>(result)];
+}
+
+std::vector<Check> diagnose(const EntitlementFacts& entitlement, const AddressFacts& address,
+                            const StorebagFacts& storebags, const MachineFacts& machine) {
+  std::vector<Check> checks{checkEntitlement(entitlement), checkAddress(address)};
+  diagnoseServer(storebags, address, checks);
+  checks.push_back(checkClientTypes(storebags));
+  checks.push_back(checkConsent(machine.consent));
+  checks.push_back(checkMessageLog(machine));
+  checks.push_back(checkSandbox(machine));
+  checks.push_back(checkDescriptors(machine));
+  checks.push_back(checkClock(machine.now));
+  return checks;
+}
+
+}  // namespace veltrad::daemon

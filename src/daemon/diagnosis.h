@@ -1,0 +1,83 @@
+// The checks of `veltractl doctor`: from facts to verdicts, each with the one thing to do. Pure functions;
+// any thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "config/storebag_source.h"
+#include "ipc/entitlements.h"
+
+namespace veltrad::daemon {
+
+struct Check {
+  // skipped: another check's failure leaves nothing to look at.
+  enum class Result { ok, warning, failure, skipped };
+  const char* name;  // of wire::check::kNames
+  Result result;
+  std::string text;  // one line
+  std::string mend;  // one line; empty unless there is a warning or a failure
+};
+
+// "ok", "warning", "failure", "skipped".
+const char* nameOf(Check::Result result);
+
+struct EntitlementFacts {
+  std::optional<ipc::RulesState> rules;  // absent: they cannot be read just now
+  std::string path;
+  unsigned uid = 0;      // of who asks
+  bool granted = false;  // to who asks
+};
+
+struct AddressFacts {
+  std::optional<std::string> inUse;      // absent: it cannot be read just now
+  std::optional<std::string> preferred;  // the preference as it is now, which holds from the next start on
+  std::string deploymentPath;
+  std::string deploymentProblem;
+};
+
+// What one request for a storebag has shown.
+struct StorebagFinding {
+  std::string name;
+  config::StorebagAnswer answer;
+  std::optional<std::string> version;
+  // The daemon's record says that the last fetch succeeded, and has no section.
+  bool emptyRecord = false;
+};
+
+struct StorebagFacts {
+  // In the order in which they were asked for. None follows one whose server gave no answer.
+  std::vector<StorebagFinding> findings;
+  bool needed = false;            // asked for by name or by a session, not for want of both
+  const char* section = nullptr;  // that the environment names; null: none
+  std::string certificatesPath;
+  std::string publicKeyPath;
+  std::vector<std::int32_t> typesWithout;  // asked for, and without a storebag
+};
+
+// The server gave no answer, so that it need not be asked for another one.
+bool endsAtServer(config::StorebagCause cause);
+
+enum class Consent { given, refused, neverGiven, noBoolean, notKnown };
+
+struct MachineFacts {
+  Consent consent = Consent::notKnown;
+  std::string messageLogPath;
+  std::string messageLogProblem;  // empty: it can be written
+  bool sandboxInForce = false;
+  std::string sandboxLine;
+  std::uint64_t descriptors = 0;        // the soft limit
+  std::uint64_t descriptorsNeeded = 0;  // for all that docs/limits.md promises
+  double now = 0;                       // seconds since 1970
+};
+
+// Fewer descriptors do not carry a start, a few clients and a post each.
+inline constexpr std::uint64_t kFewestDescriptors = 100;
+
+// All that the daemon decides, in the order of wire::check::kNames after "daemon".
+std::vector<Check> diagnose(const EntitlementFacts& entitlement, const AddressFacts& address,
+                            const StorebagFacts& storebags, const MachineFacts& machine);
+
+}  // namespace veltrad::daemon

@@ -1,0 +1,19 @@
+// `veltractl refresh`: one storebag fetched now. The asking thread, which waits for the server.
+#pragma once
+
+#include <string>
+
+#include "base/result.h"
+#include "base/value.h"
+
+namespace veltrad::daemon {
+
+class StorebagCache;
+
+// {"name", "result": "fetched" | "refused" | "failed", "signature": "good" | "bad", "reason", "version"}.
+// refused: the server gave something that is not used; failed: it gave nothing. "version" is of what is in
+// use from then on. What there is not is not a number. Fails for a name that no client type has, with one
+// line that lists the names.
+Result<Dictionary, std::string> refreshStorebag(StorebagCache& cache, const std::string& name);
+
+}  // namespace veltrad::daemon

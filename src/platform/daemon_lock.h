@@ -1,0 +1,19 @@
+// The lock that says that a daemon runs under a root. One thread at a time.
+#pragma once
+
+#include <string>
+
+#include "base/file_descriptor.h"
+#include "base/result.h"
+
+namespace veltrad::platform {
+
+struct LockRefusal {
+  bool held = false;        // another process holds it; else it is out of reach
+  std::string description;  // "process 12 holds /run/veltrad/lock", "/run/veltrad/lock: Permission denied"
+};
+
+// Makes the file where it is missing. Held until the descriptor is closed.
+Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path);
+
+}  // namespace veltrad::platform

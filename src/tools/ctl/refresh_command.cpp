@@ -1,0 +1,83 @@
+// One question a storebag, so that a slow server delays its own line alone.
+#include "tools/ctl/refresh_command.h"
+
+#include <fmt/format.h>
+
+#include <string>
+#include <vector>
+
+#include "base/text.h"
+#include "formats/json.h"
+#include "tools/ctl/control_client.h"
+#include "tools/ctl/print.h"
+#include "wire/names.h"
+
+namespace veltrad::ctl {
+
+namespace {
+
+// The daemon gives a server 15 s, and may wait for another's fetch of the same name first.
+constexpr std::chrono::seconds kPatience{60};
+
+// Those with a record, else all.
+Result<std::vector<std::string>, std::string> namesToRefresh(ControlClient& daemon) {
+  const auto status = daemon.ask(wire::question::kStatus);
+  if (!status) return Failure{status.error()};
+  std::vector<std::string> all, asked;
+  const Array* storebags = status.value().array("storebags");
+  for (const Value& one : storebags ? *storebags : Array()) {
+    const Dictionary* storebag = one.asDictionary();
+    const std::string* name = storebag ? storebag->string("name") : nullptr;
+    const std::string* state = storebag ? storebag->string("state") : nullptr;
+    if (!name || !state) continue;
+    all.push_back(*name);
+    if (*state != "never") asked.push_back(*name);
+  }
+  return asked.empty() ? all : asked;
+}
+
+std::string textOf(const Dictionary& from, const char* key) {
+  const std::string* text = from.string(key);
+  return text ? escapedForLog(*text) : std::string();
+}
+
+std::string lineOf(const Dictionary& storebag, bool fetched) {
+  std::string line = fmt::format("{}: {}", textOf(storebag, "name"), textOf(storebag, "result"));
+  const std::string signature = textOf(storebag, "signature"), reason = textOf(storebag, "reason");
+  const std::string version = textOf(storebag, "version");
+  if (!signature.empty()) line += ", signature " + signature;
+  if (!reason.empty()) line += ": " + reason;
+  if (!version.empty()) line += fetched ? ", version " + version : "; version " + version + " stays in use";
+  return line;
+}
+
+}  // namespace
+
+int runRefresh(const Options& options) {
+  auto daemon = ControlClient::connect(options.root);
+  auto names = !daemon ? Result<std::vector<std::string>, std::string>(Failure{daemon.error()})
+               : options.care.key.empty() ? namesToRefresh(daemon.value())
+                                          : std::vector{options.care.key};
+  if (!names) {
+    complain(names.error());
+    return 1;
+  }
+  Array storebags;
+  bool all = true;
+  for (const std::string& name : names.value()) {
+    auto answer = daemon.value().ask(wire::question::kRefresh, {{"name", name}}, kPatience);
+    if (!answer) {
+      complain(answer.error());
+      return 1;
+    }
+    const bool fetched = textOf(answer.value(), "result") == "fetched";
+    all = all && fetched;
+    if (!options.json && !printLine(lineOf(answer.value(), fetched))) return 1;
+    storebags.push_back(std::move(answer.value()));
+  }
+  if (options.json && !printLine(formats::writeJSON(Dictionary{{"storebags", std::move(storebags)}})))
+    return 1;
+  return all ? 0 : 1;
+}
+
+}  // namespace veltrad::ctl
