@@ -1,4 +1,4 @@
-"""Checks format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
+"""Checks license, format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
 place; the exit status is 1 if there is any."""
 import collections
 import concurrent.futures
@@ -19,6 +19,9 @@ KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
 LONGEST_BODY = 380
 LONGEST_HEADER = 300
 LARGEST_UNIT = 24
+LICENSE_LINE = "SPDX-License-Identifier: Apache-2.0"
+COMMENT_OF = {".cpp": ("//", ""), ".h": ("//", ""), ".hpp": ("//", ""), ".c": ("/*", " */"), ".py": ("#", ""),
+              ".cmake": ("#", ""), ".map": ("/*", " */"), ".def": ("//", "")}
 
 
 def sources(*suffixes):
@@ -26,6 +29,37 @@ def sources(*suffixes):
         for path in sorted((ROOT / folder).rglob("*")):
             if path.suffix in suffixes:
                 yield path
+
+
+def licensed():
+    """Every file that can hold a comment."""
+    done = subprocess.run(["git", "ls-files"], cwd=ROOT, capture_output=True, text=True)
+    names = done.stdout.splitlines() or [str(path.relative_to(ROOT)) for path in ROOT.rglob("*")]
+    for name in names:
+        path = ROOT / name
+        if path.is_file() and (path.suffix in COMMENT_OF or path.name == "CMakeLists.txt" or is_script(path)):
+            yield path
+
+
+def is_script(path):
+    with path.open("rb") as file:
+        return "corpus" not in path.parts and file.read(2) == b"#!"
+
+
+def check_license(add=False):
+    """Every source names its license in its first line, or after "#!"; with --add-license the line is put where it is missing."""
+    found = []
+    for path in licensed():
+        text = path.read_text()
+        if any(re.fullmatch(rf"(//|/\*|#) {LICENSE_LINE}( \*/)?", line) for line in text.split("\n")[:2]):
+            continue
+        if not add:
+            found.append(f"{path.relative_to(ROOT)}: no line \"{LICENSE_LINE}\"; run scripts/check --add-license")
+            continue
+        begin, end = ("/*", " */") if text.startswith("/*") else COMMENT_OF.get(path.suffix, ("#", ""))
+        first = text.index("\n") + 1 if text.startswith("#!") else 0
+        path.write_text(f"{text[:first]}{begin} {LICENSE_LINE}{end}\n{text[first:]}")
+    return found
 
 
 def check_format():
@@ -59,7 +93,7 @@ def check_ladder():
 def check_size():
     found = []
     for path in sources(".cpp", ".h", ".hpp"):
-        lines = len(path.read_text().splitlines())
+        lines = len(path.read_text().splitlines()) - 1  # without that of the license
         bound = LONGEST_BODY if path.suffix == ".cpp" else LONGEST_HEADER
         if path.relative_to(ROOT).parts[0] == "src" and lines > bound:
             found.append(f"{path.relative_to(ROOT)}: {lines} lines, more than {bound}; look for the second class in it")
@@ -152,9 +186,11 @@ def check_lint(changed=None):
 
 
 def main():
-    checks = {"format": check_format, "include ladder": check_ladder, "size": check_size,
+    if "--add-license" in sys.argv[1:]:
+        check_license(add=True)
+    checks = {"license": check_license, "format": check_format, "include ladder": check_ladder, "size": check_size,
               "must not compile": check_must_not_compile, "lint": check_lint}
-    arguments = sys.argv[1:]
+    arguments = [argument for argument in sys.argv[1:] if argument != "--add-license"]
     if arguments == ["--no-lint"]:
         del checks["lint"]
     elif arguments == ["--changed"]:
