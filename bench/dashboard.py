@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Measures the dashboard with the programs in VELTRA_BUILD (by default build/release): 10,000 messages a second from 100
 sessions for five seconds, with acknowledgements; and the CPU time of 1,000 idle sessions with reliable UDP."""
 import json

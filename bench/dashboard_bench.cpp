@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares a message to a dashboard (packet, text line, queue and send) with a bare send of the same bytes.
 // Prints CPU microseconds of each. A thread reads from the server's socket.
 #include <arpa/inet.h>

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Measures the cost of families with the programs in VELTRA_BUILD (by default build/release): the daemon's CPU time for a
 message of a root, and of a child with and without an aggregating root, and the time of a refresh of 1,000 sessions."""
 import contextlib

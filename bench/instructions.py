@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Counts the daemon's instructions with callgrind: for a start, and for each message of three kinds. Unlike times, the counts
 do not depend on what else the machine does. Uses the programs in VELTRA_BUILD (by default build/release). With a file as its
 argument, it compares with the figures there and fails if one has grown by more than 5 %; --record FILE writes them."""

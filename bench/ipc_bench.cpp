@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares the round trip of a message and its reply through a connection of the daemon with two threads that
 // exchange the same bytes over a bare socket. Prints nanoseconds and the ratio, with both ends on one core
 // and with both on any core.

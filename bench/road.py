@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Measures the path of a message with the programs in VELTRA_BUILD (by default build/release): sends of one client
 compared with a bare socket ping-pong, the daemon's CPU time per message, its memory, and its start time. Ratios can be
 compared; single figures depend on the machine. With VELTRA_PIN=1 everything runs on one core."""

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares sends of one client with a bare socket ping-pong of the same bytes, interleaved in one run. Prints
 // JSON. Usage: send_bench ROOT (the daemon of that root must serve client type 6 with a batching back end)
 #include <fmt/format.h>

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Compares an upload of 100 MiB with `gzip -6 | curl`, with the programs in VELTRA_BUILD (by default build/release): the
 time of both for the same bytes, alternating, and the daemon's peak of resident memory above rest. The files are log text
 and noise."""

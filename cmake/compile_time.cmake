@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # What shortens a build without changing its result: precompiled headers and lld, for the presets that use Clang. Unity builds
 # are switched on in CMakePresets.json. Figures: docs/decisions/0017-build-time.md.
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # What cmake --install puts where, by component: daemon, library, development, tools, lab, python. Everything is relative to
 # the prefix, except that /usr has its configuration in /etc.
 include(CMakePackageConfigHelpers)

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # Manual pages, made from docs/reference by pandoc, and completions; both are installed with the program that they are for.
 install(FILES ${PROJECT_SOURCE_DIR}/packaging/completions/veltractl.bash RENAME veltractl
         DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions COMPONENT tools)

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # Warnings, sanitizers, and veltra_room(), which defines one library for each folder of src/.
 #
 # A room's headers are visible only to the rooms that link it: its include directory is build/PRESET/rooms/ROOM, which

@@ -1,3 +1,4 @@
+/* SPDX-License-Identifier: Apache-2.0 */
 /* An adaptor bundle. It appends every message to var/log/veltrad/example-adaptor.jsonl under VELTRA_ROOT, as
  * one line {"method":…,"respCode":…,"dict":…}. docs/adaptor.md says where to install it. */
 #define _GNU_SOURCE

@@ -1,3 +1,4 @@
+/* SPDX-License-Identifier: Apache-2.0 */
 /* Opens a session, starts it, sends one message and prints the daemon's answer. */
 #include <stdio.h>
 #include <veltra/veltra.h>

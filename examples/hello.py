@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """A client of the wire protocol (docs/wire-protocol.md) that uses only Python's standard library. It opens a session,
 starts it, sends one message and prints the daemon's answer."""
 

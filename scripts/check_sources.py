@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Checks license, format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
 place; the exit status is 1 if there is any."""
 import collections

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals."""
 import os
 import re

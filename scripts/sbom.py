@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Writes an SPDX 2.3 document for veltrad: the Debian packages of the libraries that the program links, directly or through
 each other. Arguments: the program, and the directory for the document."""
 import datetime

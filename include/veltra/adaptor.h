@@ -1,3 +1,4 @@
+/* SPDX-License-Identifier: Apache-2.0 */
 /* The interface of an adaptor bundle: it exports one table, `veltra_adaptor`, with its classes by name and
  * their operations by selector. See docs/adaptor.md for how to build and install a bundle, and
  * examples/adaptor.c for a complete one.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The values of veltra.hpp, which includes this file: owners of a veltra_value, with the rules of veltra.h.
 #ifndef VELTRA_VALUE_HPP
 #define VELTRA_VALUE_HPP

@@ -1,3 +1,4 @@
+/* SPDX-License-Identifier: Apache-2.0 */
 /* libveltra: report to veltrad from C. See veltra.hpp for C++20.
  *
  * Threads: every function may be called from any thread; calls on one session are carried out in the order in

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libveltra for C++20: a header-only interface to veltra.h with owners for its handles. Nothing throws; the
 // rules of veltra.h on threads, callbacks and processes apply.
 //

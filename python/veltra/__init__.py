@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """A client of veltrad that uses Python's standard library alone.
 
     import veltra

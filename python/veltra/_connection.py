@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """One connection to veltrad: frames, a bounded queue, and the thread that writes and reads. See the wire protocol in the
 documentation of veltrad."""
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Starts a lab and a daemon in a temporary root directory and runs the examples one after another. The status is 0 if
 exactly what should have arrived did arrive."""
 import shlex

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """A call that is reported to the collector and to the dashboard. Publishes examples/storebag.json, runs examples/call.jsonl
 and examples/lamp.jsonl, and shows what was sent and what arrived."""
 import collections

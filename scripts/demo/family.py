@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """A family: a root that aggregates and two children with the same identity. Each is a separate client."""
 import contextlib
 import json

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Paths and helpers that the examples share."""
 import sys
 from pathlib import Path

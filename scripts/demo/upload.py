@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """A file that is compressed, uploaded, and removed when the server has confirmed it."""
 import subprocess
 import sys

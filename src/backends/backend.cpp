@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The default behaviour of back ends.
 #include "backends/backend.h"
 

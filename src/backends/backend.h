@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // VeltraBackend, the base of all back ends. The session's thread configures it, sends and flushes; other
 // sessions' threads and the HTTP thread use its facts, state and sampling threshold.
 #pragma once

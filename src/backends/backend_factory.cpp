@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Maps names to kinds of back ends.
 #include "backends/backend_factory.h"
 

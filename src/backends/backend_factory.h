@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes back ends by name. Any thread.
 #pragma once
 

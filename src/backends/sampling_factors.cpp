@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The digest behind a stable sampling factor. Any thread.
 #include "backends/sampling_factors.h"
 

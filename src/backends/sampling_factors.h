@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sampling factors that are the same after every start. Any thread.
 #pragma once
 

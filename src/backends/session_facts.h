@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session tells its back ends about itself, its client and the device.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Base64 (RFC 4648, section 4), encoded without line breaks.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file descriptor that is closed with its owner, and writing to one.
 #pragma once
 

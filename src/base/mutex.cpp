@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The run-time check of the lock order: each thread keeps a list of the ranks that it holds.
 #include "base/mutex.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Mutexes with annotations for Clang's thread safety analysis and, in debug builds, a check of the lock
 // order.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a binary property list declares in its trailer, and the number of objects in a value.
 #include "base/property_list.h"
 

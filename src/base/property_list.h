@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads and writes binary property lists (version "bplist00"), and states the limits of every reader of
 // property lists.
 #pragma once

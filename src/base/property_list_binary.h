@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The binary property list format: its constants, and its trailer.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads binary property lists from untrusted bytes.
 //
 // Layout: "bplist00", the objects, a table of their offsets, and a trailer of 32 bytes that says where the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes binary property lists in two passes: one measures, one writes into a buffer of exactly that size.
 #include <bit>
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Result<T, E>: a value, or an error that says why there is none.
 #pragma once
 

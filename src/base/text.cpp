@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // UTF-8 (RFC 3629), lower case, percent-encoding, hexadecimal digits and log lines.
 #include "base/text.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Functions on texts: UTF-8, letter case, trimming and escaping.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A pthread with its own stack size.
 #include "base/thread.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A joinable thread with a stack of a given size. The object is used by one thread at a time.
 #pragma once
 

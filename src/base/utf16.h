@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Conversion between big-endian UTF-16 and UTF-8, character by character and without a copy.
 #pragma once
 

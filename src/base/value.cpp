@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Conversions of values, and dictionaries as sorted vectors.
 #include "base/value.h"
 

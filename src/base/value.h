@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Value: the content of a property list. Immutable and shared: copies are cheap, a change makes a new value.
 #pragma once
 

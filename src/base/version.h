@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The version of all programs and of the library, "8.0".
 #pragma once
 

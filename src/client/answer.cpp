@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads replies, and implements the C interface's functions on them.
 #include "client/answer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The answer to a call, which is the C interface's veltra_reply.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Calls that are waiting for their answers.
 #include "client/call_table.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The open calls of one session, and what has arrived for its callbacks. Used under its connection's lock.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the argument dictionaries and frames of calls.
 #include "client/calls.h"
 

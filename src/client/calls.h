@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the frames of a session's calls, without their call IDs.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends calls, receives answers and events, and runs callbacks.
 #include "client/daemon_connection.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The client's end of a connection to the daemon. Any thread may make calls; callbacks run on its own thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Connects to the daemon and exchanges hellos. Every failure has a text that says what to do.
 #include "client/daemon_socket.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Connects to the daemon's socket and exchanges the first frames.
 #pragma once
 

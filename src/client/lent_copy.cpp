@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Copies with pread, which leaves the file's position unchanged.
 #include "client/lent_copy.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Copies a file for the daemon, which does not take files of network or FUSE file systems.
 #pragma once
 

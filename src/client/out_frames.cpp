@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes frames without blocking.
 #include "client/out_frames.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The frames of one session that wait to be written. Used under its connection's lock.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The C interface's functions on sessions.
 #include <cstdlib>
 #include <cstring>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Opens and removes a file relative to its directory.
 #include "client/uploaded_file.h"
 

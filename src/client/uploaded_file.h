@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file that a session uploads: it is lent to the daemon, and removed by the library.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Nodes, and their conversion from and to veltrad::Value.
 #include "client/value_node.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The C interface's veltra_value: a reference-counted node of a tree. Any thread may read a node; only its
 // owner changes it, one thread at a time.
 #pragma once

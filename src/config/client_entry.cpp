@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tables of the keys of a client entry, its filters and its country thresholds.
 #include "config/client_entry.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A parsed entry of the "clients" of an HTTPS post back end.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the values of keys.
 #include "config/key_table.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Tables of the keys of storebags. One row makes a key known to the parser, to the code that uses it and to
 // lint.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The keys of settings.json, and which of its contents holds. Any thread.
 #include "config/operator_settings.h"
 

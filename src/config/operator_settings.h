@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // etc/veltrad/settings.json: what an operator chooses for the fleet. Any thread; the file is reread when it
 // changed.
 #pragma once

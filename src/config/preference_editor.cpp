@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // By the table of preferences, through their files.
 #include "config/preference_editor.h"
 

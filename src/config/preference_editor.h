@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Shows and changes the preferences that the system reads. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table, and values by it.
 #include "config/preference_keys.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The preferences that the system reads: one table for those who read, change and describe them. Constants
 // and pure functions; any thread.
 #pragma once

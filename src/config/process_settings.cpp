@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Computes the settings of the process from preferences, the device and deployment.plist.
 #include "config/process_settings.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Settings that are constant for the life of the process. Any thread may ask.
 #pragma once
 

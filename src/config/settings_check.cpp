@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What is wrong with the keys of a settings file, and where. A plain function; any thread.
 #include "config/settings_check.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares a settings file with the table of its keys. A plain function; any thread.
 #pragma once
 

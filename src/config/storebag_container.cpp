@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads a storebag container and the storebag in it.
 #include "config/storebag_container.h"
 

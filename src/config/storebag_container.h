@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads, from untrusted bytes, the signed container of a storebag: its texts, the signed bytes, and the
 // storebag.
 #pragma once

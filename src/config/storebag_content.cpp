@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tables of the keys of a storebag, its sections and its back ends.
 #include "config/storebag_content.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A parsed storebag: its top level, the section of an environment, and the entries of back ends. Immutable
 // and shared by sessions.
 #pragma once

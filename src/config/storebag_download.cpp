@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Downloads storebags and verifies their signatures.
 #include "config/storebag_download.h"
 

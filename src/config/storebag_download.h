@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Downloads storebags and verifies their signatures. Blocks the caller's thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Verifies RSA signatures with OpenSSL's EVP interface, which checks digest and padding.
 #include "config/storebag_key.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The RSA public key with which storebags are verified.
 #pragma once
 

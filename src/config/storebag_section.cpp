@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Selects the section of the process's environment from a storebag.
 #include "config/storebag_section.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Downloads the storebag of a client type and selects the section of the process's environment.
 #pragma once
 

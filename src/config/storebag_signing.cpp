@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keys that sign storebags, with OpenSSL.
 #include "config/storebag_signing.h"
 

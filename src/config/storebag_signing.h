@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keys that sign storebags, and the signed container, for tools; the daemon never signs.
 #pragma once
 

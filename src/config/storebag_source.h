@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The interface from which the agent gets storebag sections, and its answers.
 #pragma once
 

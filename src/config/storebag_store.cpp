@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files of storebags. Any thread; one at a time for a name.
 #include "config/storebag_store.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Storebags that survive a restart: a file a name, as they were downloaded. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finds sessions by their level.
 #include "daemon/correlated_list.h"
 

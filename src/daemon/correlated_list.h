@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sessions that share a user-info key, ordered by level and time of joining. Guarded by the families' lock.
 #pragma once
 

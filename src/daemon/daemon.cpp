@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Passes the services to the rooms.
 #include "daemon/daemon.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Connects the daemon's rooms. Main thread.
 #pragma once
 

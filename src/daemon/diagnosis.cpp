@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each check by itself; those about the server know what was found on the way to it.
 #include "daemon/diagnosis.h"
 

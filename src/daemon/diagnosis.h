@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The checks of `veltractl doctor`: from facts to verdicts, each with the one thing to do. Pure functions;
 // any thread.
 #pragma once

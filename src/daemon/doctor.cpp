@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where each fact comes from.
 #include "daemon/doctor.h"
 

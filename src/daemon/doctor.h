@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Gathers the facts that `veltractl doctor` is answered from. The asking thread, which may wait for the
 // storebag server.
 #pragma once

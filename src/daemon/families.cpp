@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Adds and removes sessions, refreshes families and finds the session that gets a copy.
 #include "daemon/families.h"
 

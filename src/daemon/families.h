@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Families: the sessions that share an identity. Determines each session's parent and combined ID, its back
 // ends' states, and which client gets copies.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The places of this room's locks in the lock order (base/mutex.h).
 #pragma once
 

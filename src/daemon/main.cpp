@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // veltrad: prepares the process, serves until a signal, and stops in order.
 #include <unistd.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon's metrics as OpenMetrics text.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What those who look after the device are answered on the control socket.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A fetch's answer in the words of those who asked.
 #include "daemon/refresh.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `veltractl refresh`: one storebag fetched now. The asking thread, which waits for the server.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon's services, made once by main and passed to the rooms by reference.
 #pragma once
 

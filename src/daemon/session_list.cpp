@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sessions come, tell of themselves and go.
 #include "daemon/session_list.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sessions that the daemon serves. A transaction is open while there are any. Any thread.
 #pragma once
 

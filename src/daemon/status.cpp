@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the rooms know of themselves, put together for those who ask.
 #include "daemon/status.h"
 

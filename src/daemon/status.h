@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What `veltractl status` shows of the running daemon, as property list values. The asking thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides when to download, and takes the result into the cache.
 #include "daemon/storebag_cache.h"
 

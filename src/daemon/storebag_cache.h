@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The storebags that the daemon has downloaded, one record per name. Any thread.
 #pragma once
 

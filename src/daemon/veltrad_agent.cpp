@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Accepts and removes connections.
 #include "daemon/veltrad_agent.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // VeltradAgent: accepts connections and owns the session list, the families and the storebag cache. Any
 // thread.
 #pragma once

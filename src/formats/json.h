@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads and writes values as JSON (RFC 8259).
 #pragma once
 

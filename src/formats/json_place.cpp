@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where in a JSON text a key or an element stands. Any thread.
 #include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>

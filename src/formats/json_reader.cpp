@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads JSON with RapidJSON's iterative parser, whose events become values directly.
 #include <fmt/format.h>
 #include <rapidjson/error/en.h>

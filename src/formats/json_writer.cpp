@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes JSON with RapidJSON's writers directly into a string.
 #include <rapidjson/prettywriter.h>
 #include <rapidjson/writer.h>

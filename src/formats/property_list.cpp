@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Distinguishes the two forms of property lists.
 #include "formats/property_list.h"
 

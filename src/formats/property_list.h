@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads and writes XML property lists (document type "plist", version 1.0), and reads lists of either form.
 #pragma once
 

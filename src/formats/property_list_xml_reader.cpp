@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads XML property lists from untrusted bytes, with Expat over one bounded buffer.
 #include <expat.h>
 #include <fmt/format.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Numbers and dates of XML property lists, with std::from_chars and the calendar of std::chrono.
 #include "formats/property_list_xml_scalars.h"
 

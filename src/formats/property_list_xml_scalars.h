@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The texts of numbers and dates in XML property lists, independent of the locale.
 #pragma once
 

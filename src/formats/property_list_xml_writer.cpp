@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes XML property lists in UTF-8, indented by tabs.
 #include <fmt/format.h>
 

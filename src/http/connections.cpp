@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sockets of libcurl's connections, and the certificates that they trust.
 #include "http/connections.h"
 

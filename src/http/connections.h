@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sockets and the trusted certificate authorities of HTTPS connections. HTTP thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The settings of libcurl for a transfer, and its callbacks.
 #include "http/curl_transfer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One HTTPS exchange: its request, the settings of libcurl, and the answer.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Passes requests from any thread to the HTTP thread, and runs that thread's loop.
 #include "http/http_client.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // HTTPS requests. Any thread may start one; completions run on the client's thread and must not block.
 #pragma once
 

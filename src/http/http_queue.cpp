@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides which HTTP request runs next, and counts those in progress.
 #include "http/http_queue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue of HTTP requests, from any thread to the HTTP thread.
 #pragma once
 

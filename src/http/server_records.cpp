@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One entry for each address, within a bound.
 #include "http/server_records.h"
 

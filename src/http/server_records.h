@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the servers that requests went to have answered of late. Any thread.
 #pragma once
 

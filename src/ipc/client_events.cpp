@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes and sends the frames of events.
 #include "ipc/client_events.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The events that the daemon sends to a client, from any thread.
 #pragma once
 

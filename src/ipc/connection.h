@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The interfaces of a client's connection and of the listener's delegate.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decodes calls, charges their memory, and runs them by a table of operations.
 #include "ipc/dispatcher.h"
 

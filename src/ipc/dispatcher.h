@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs the calls in frames on a session, on the connection's own thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the entitlement rules and applies them to peers.
 #include "ipc/entitlements.h"
 

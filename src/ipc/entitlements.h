@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who may do what: etc/veltrad/entitlements.plist or .json, reread when it changed. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Accepts and limits connections, and joins the threads that have ended.
 #include "ipc/listener.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Accepts clients, gives each connection its own thread, and joins the threads that have ended.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a connection to the control socket is answered by. The connection's own thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes, queues, charges and limits frames to a client.
 #include "ipc/out_queue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The frames that wait to be written to one client.
 #pragma once
 

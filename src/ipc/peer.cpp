@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Asks the kernel about peers.
 #include "ipc/peer.h"
 

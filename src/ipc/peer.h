@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The process at the other end of a Unix socket, as the kernel knew it when it connected.
 #pragma once
 

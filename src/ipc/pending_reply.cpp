@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends results as reply frames.
 #include "ipc/pending_reply.h"
 

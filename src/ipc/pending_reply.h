@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reply to one call, to be sent from any thread.
 #pragma once
 

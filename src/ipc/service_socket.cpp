@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Takes the lock, removes a stale socket and makes the listening one.
 #include "ipc/service_socket.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sockets on which the daemon is reached, and the lock that says which process is the daemon. Made and
 // used by one thread at a time.
 #pragma once

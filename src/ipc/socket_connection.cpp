@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Receives frames, runs their calls and ends the connection.
 #include "ipc/socket_connection.h"
 

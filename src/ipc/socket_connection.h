@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One client's connection over a Unix socket.
 #pragma once
 

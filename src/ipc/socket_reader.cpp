@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads with recvmsg, and charges the buffer.
 #include "ipc/socket_reader.h"
 

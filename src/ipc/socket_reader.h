@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads bytes and descriptors from a socket, and charges their memory. Used by the connection's own thread.
 #pragma once
 

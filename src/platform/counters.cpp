@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes the counters as JSON.
 #include "platform/counters.h"
 

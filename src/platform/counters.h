@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts by reason what happens to messages, from any thread and without locks.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One flock on a file that stays.
 #include "platform/daemon_lock.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The lock that says that a daemon runs under a root. One thread at a time.
 #pragma once
 

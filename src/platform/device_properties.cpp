@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The configured list first, then the machine. Any thread; the machine's files are read at each question.
 #include "platform/device_properties.h"
 

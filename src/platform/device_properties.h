@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The device property service: facts about this device by key. Any thread may ask.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The secret is read or made once. Any thread.
 #include "platform/device_secret.h"
 

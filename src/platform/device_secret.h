@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The secret of this device, which nothing that leaves it reveals. Any thread.
 #pragma once
 

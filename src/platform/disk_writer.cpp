@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Queues of jobs, and the thread that runs them in turn.
 #include "platform/disk_writer.h"
 

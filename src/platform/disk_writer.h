@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A thread that does disk work for threads that must not wait for the disk.
 #pragma once
 

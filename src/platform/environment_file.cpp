@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Parses NAME=value lines.
 #include "platform/environment_file.h"
 

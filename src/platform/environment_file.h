@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads values from files of NAME=value lines, such as os-release and locale.conf.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads and replaces files on disk.
 #include "platform/file_store.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading and replacing whole files, from any thread.
 #pragma once
 

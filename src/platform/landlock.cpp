@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Landlock's three system calls.
 #include "platform/landlock.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's Landlock interface (landlock(7)), by number, because the system's headers may be older than
 // the kernel.
 #pragma once

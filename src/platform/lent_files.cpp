@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lent files by token.
 #include "platform/lent_files.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files that clients lend to the daemon for the duration of one call, each under a random token. Any thread.
 #pragma once
 

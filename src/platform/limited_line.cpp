@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Limits a log line to one a second.
 #include "platform/limited_line.h"
 

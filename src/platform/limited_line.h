@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Limits the rate of a log line that others can cause at will. Any thread.
 #pragma once
 

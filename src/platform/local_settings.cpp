@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which form of a settings file counts, and what it says. Its owner locks.
 #include "platform/local_settings.h"
 

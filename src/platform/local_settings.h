@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A settings file under etc/veltrad, as JSON with comments or as a property list. Its owner locks.
 #pragma once
 

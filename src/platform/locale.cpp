@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Country and time zone from the environment, which does not change after the start.
 #include "platform/locale.h"
 

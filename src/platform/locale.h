@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The country of the current locale, and the offset of the local time zone. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes log lines to the journal, standard error or syslog. A line is one system call.
 #include "platform/log.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The process's log, usable from any thread.
 //
 //   logDebug("setSessionInfo: Configuring session %u", sessionID);

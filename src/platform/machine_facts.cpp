@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts from the machine's files.
 #include "platform/machine_facts.h"
 

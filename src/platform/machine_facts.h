@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts about the machine from os-release, DMI, the device tree and the machine id.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Memory accounts: their sums, waiting for memory, and dropping what may be dropped.
 #include "platform/memory_budget.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Accounts of the memory that the daemon keeps for its clients: one for each user id, and a total. Any
 // thread.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Preference domains as property list files.
 #include "platform/preferences.h"
 

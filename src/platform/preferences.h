@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Preference domains: DOMAIN.plist under var/lib/veltrad/preferences, read at each use. Any thread.
 #pragma once
 

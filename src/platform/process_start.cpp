@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Standard descriptors, the environment, and the guard against exit().
 #include "platform/process_start.h"
 

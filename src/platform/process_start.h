@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Prepares the daemon's process and guards its end. Main thread, before any other thread exists.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The 48-bit linear congruential sequence, starting from zero.
 #include "platform/random.h"
 

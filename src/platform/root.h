@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The root directory, and the system's fixed paths under it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The main run loop, which waits on a signal descriptor and a wake-up descriptor.
 #include "platform/run_loop.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The main run loop: waits for SIGTERM or SIGINT. Main thread; blockSignals() before any other thread exists.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon's sandbox profile, and entering it.
 #include "platform/sandbox.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sandbox: Landlock and no-new-privileges. To be entered on the main thread before any other thread
 // exists, because the rules apply only to the calling thread and those that it starts later.
 #pragma once

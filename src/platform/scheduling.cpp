@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scheduling class, heaps and limits. Failures are ignored, because no user would notice them.
 #include "platform/scheduling.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Scheduling class, heaps and limits of the process. To be set on the main thread before any other exists,
 // because threads inherit them.
 #pragma once

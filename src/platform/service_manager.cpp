@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Notifications and socket activation with libsystemd.
 #include "platform/service_manager.h"
 

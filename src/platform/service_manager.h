@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service manager, if there is one: readiness, status, watchdog, socket activation.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Queues writes of the state's text.
 #include "platform/state_file.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file that shows a state of the process, rewritten when the state has changed. Main thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reports the transaction as the service manager's STATUS text.
 #include "platform/transaction.h"
 

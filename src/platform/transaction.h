@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The platform transaction, which is open while the daemon serves sessions.
 #pragma once
 

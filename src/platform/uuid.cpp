@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // UUIDs (RFC 4122, version 4) from the kernel's random bytes.
 #include "platform/uuid.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Queues copies for one client.
 #include "session/aggregation.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Aggregation: sends one session's client copies of its messages and of those of the sessions below it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the back ends of a session and reads their states.
 #include "session/backend_set.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The back ends of one session, made from a storebag section.
 #pragma once
 

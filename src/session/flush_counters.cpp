@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts the answers to flushes.
 #include "session/flush_counters.h"
 

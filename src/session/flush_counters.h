@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Flushes that wait for the answers of their back ends. Any thread.
 #pragma once
 

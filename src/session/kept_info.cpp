@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps a dictionary together with its charge.
 #include "session/kept_info.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps the session info and the user info that a client sends.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends one-shot messages.
 #include "session/one_shot.h"
 

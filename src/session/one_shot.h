@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends a single message without a started session, through back ends made for the call.
 #pragma once
 

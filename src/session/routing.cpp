@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Calls every back end of a session in order.
 #include "session/routing.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Passes a session's messages, flushes and uploads to its back ends. The session's thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session needs of the daemon: storebags, and its place among related sessions.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the payload of the start message.
 #include "session/start_message.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The payload of the message that a session sends at its start.
 #pragma once
 

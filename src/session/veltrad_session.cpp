@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Configures and starts a session, sends its messages, answers its queries and ends it.
 #include "session/veltrad_session.h"
 

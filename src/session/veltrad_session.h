@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // VeltradSession: the daemon's side of one client connection. Only the connection's thread calls it; it tells
 // others what they need to know about it (FamilyFacts, Aggregation).
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads device properties by their keys.
 #include "support/device_identity.h"
 

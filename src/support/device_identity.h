@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts about the device that the daemon reports. Any thread may ask.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compresses with zlib's deflate in one pass over the input.
 #include "support/gzip.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compression to a gzip stream (RFC 1952) on the caller's thread. Failures are logged here.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The diagnostic message log: chooses, writes and removes its files.
 #include "support/message_log.h"
 

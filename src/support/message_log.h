@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The diagnostic message log: a readable record of what the back ends sent. Any thread may write.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts about the client library, from its resources and the preferences.
 #include "support/veltra.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts about the client library that the daemon uses: its package version, public key and identifiers.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads what CLI11 knows of a command line.
 #include "tools/command_line.h"
 

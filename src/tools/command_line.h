@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A command line as data, from which help pages and completions are made.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The interface of a session that the daemon exports to each connection. The connection's own thread makes
 // the calls, one at a time and in order.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The names that the daemon, the library and storebags share.
 #pragma once
 

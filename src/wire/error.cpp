@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Error objects and their dictionaries on the wire.
 #include "wire/error.h"
 

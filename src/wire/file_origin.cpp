@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Uses /proc and calls that never leave the kernel: fstat, fstatfs and read could wait for a file server.
 #include "wire/file_origin.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What kind of file system an open file belongs to, determined without contacting a file server.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Encodes and decodes frames.
 #include "wire/frame.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Frames of the wire protocol (docs/wire-protocol.md), read from and written to memory.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The limits of frames, the same for both ends of the socket.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The names in frames (docs/wire-protocol.md): operations, events and keys.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reasons that are counted for messages and for what carries them: one table for the daemon and its
 // tools.
 #pragma once

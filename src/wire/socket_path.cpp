@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Paths under the root directory.
 #include "wire/socket_path.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The path of the daemon's socket under the root directory, for both ends of the socket.
 #pragma once
 

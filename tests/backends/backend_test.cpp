@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What every back end has: event numbers, versions, digests, facts.
 #include "backends/backend.h"
 

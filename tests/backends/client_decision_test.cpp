@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The borders of the decision on a client entry and of its filters; the rest of the tables is
 // played by real processes.
 #include "backends/https/client_decision.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The dashboard back end at its door: datagrams as a real socket receives them, and the lines that come back.
 #include <arpa/inet.h>
 #include <gtest/gtest.h>

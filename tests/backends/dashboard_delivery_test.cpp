@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What becomes of a dashboard datagram after its first transmission, on ticks and a time that the test sets.
 #include <gtest/gtest.h>
 

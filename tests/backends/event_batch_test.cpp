@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bounds and sums of a batch, and what happens to it while the session ID changes or memory runs out.
 #include "backends/https/event_batch.h"
 

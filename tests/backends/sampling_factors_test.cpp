@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Stable sampling factors, and which back ends get one.
 #include "backends/sampling_factors.h"
 

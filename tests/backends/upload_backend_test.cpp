@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What real processes do not show of uploads: how far a file is read that changes meanwhile, and who gets the
 // next place.
 #include <fcntl.h>

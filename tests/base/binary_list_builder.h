@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Puts binary property lists together byte by byte, valid or not, for tests. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The order of locks as it is checked at run time, in debug builds alone.
 #include "base/mutex.h"
 

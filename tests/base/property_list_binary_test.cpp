@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Binary property lists: every object type, what is written, what is refused.
 #include <gtest/gtest.h>
 

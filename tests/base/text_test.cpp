@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Texts: base64, UTF-8 at its borders, letter case beyond ASCII, log lines.
 #include "base/text.h"
 

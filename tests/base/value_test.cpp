@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Value's rules for numbers and booleans, the dictionary's order, and JSON both ways.
 #include "base/value.h"
 

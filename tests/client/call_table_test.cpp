@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Calls under way: which of them an answer, an event or the end of the connection reaches.
 #include "client/call_table.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What becomes of calls when the daemon does not read, goes away, or the session is closed.
 #include "harness.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A daemon's end of the wire for the library's tests: a real socket under a root of its own, and for each
 // client a thread that answers its calls as the test says.
 #pragma once

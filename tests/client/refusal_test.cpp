@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A daemon that says nothing, and arguments that are refused before anything is sent.
 #include "client/daemon_socket.h"
 #include "harness.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sessions against a scripted daemon: calls out and answers in, one after the other and many at once.
 #include "harness.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files on their way out: descriptors among waiting frames, and removal for those who ask for no answer.
 #include <fstream>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Values of the C interface: what may be put into what, and who lets it go.
 #include <gtest/gtest.h>
 

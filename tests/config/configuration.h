@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A daemon's configuration in memory, beside a storebag server that answers as the test says, and its log.
 #pragma once
 

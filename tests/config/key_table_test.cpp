@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every key of a storebag, by the tables themselves: what is read of a value of its type, of another type and
 // beyond its range.
 #include "config/key_table.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where the storebag server comes from, and what is not known during a shortage.
 #include "config/process_settings.h"
 

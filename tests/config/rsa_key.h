@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A key of the test's own, able to sign as it should be done and in every way that it should not.
 #pragma once
 

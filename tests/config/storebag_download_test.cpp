@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The download of a storebag and the choice of its section: what is asked, what each answer leads to, and
 // what it says in the log.
 #include "config/storebag_download.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What counts as a signature, and what counts as a key: everything that comes close must not.
 #include "config/storebag_key.h"
 

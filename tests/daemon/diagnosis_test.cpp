@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The verdicts of `veltractl doctor` that no broken set-up in tests/e2e/test_doctor.py brings about.
 #include "daemon/diagnosis.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Families: parents, combined IDs, states and copies of sessions that share an identity.
 #include "daemon/families.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The storebag cache: what it downloads, when, and what a failure leaves.
 #include "daemon/storebag_cache.h"
 

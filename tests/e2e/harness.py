@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Runs real processes (the lab, the daemon, its clients) in a temporary root directory. Everything waits for a condition,
 with a deadline; nothing sleeps for a result."""
 import atexit

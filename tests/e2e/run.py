@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """Runs the tests with real processes: all of them, or those given as arguments (road, test_road.Road.test_examples).
 
 VELTRA_BUILD is the build directory, by default build/dev. Each class runs in its own process, two at a time. The last line

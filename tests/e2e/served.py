@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """A file system with regular files that this process serves with the kernel's FUSE protocol (linux/fuse.h). It can leave
 requests unanswered."""
 import contextlib

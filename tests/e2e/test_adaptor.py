@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Working and faulty adaptor bundles, used through the built-in storebag without a storebag server."""
 import json
 import os

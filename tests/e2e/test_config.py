@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """veltractl config, refresh and report: what is changed, fetched and passed on."""
 import fcntl
 import json

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The control socket: what those who look after the device are told."""
 import json
 import os

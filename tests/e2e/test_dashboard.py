@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The dashboard: datagrams, lost and wrong acknowledgements, a missing server, the end of a session."""
 import collections
 import json

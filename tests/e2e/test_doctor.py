@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """veltractl doctor: set-ups that are broken in one place each, the check that finds it and what it says to do."""
 import json
 import os

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Access to the daemon, and its start and stop."""
 import contextlib
 import multiprocessing

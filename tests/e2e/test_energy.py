@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The energy log: many clients at once, rotation by logrotate, a full disk, a link in place of the file."""
 import concurrent.futures
 import json

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Families of sessions: combined IDs, states from the parent, copies to the client that aggregates."""
 import concurrent.futures
 import re

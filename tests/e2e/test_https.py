@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The HTTPS back end: client entries, filters, batches, collectors that fail on request, hostile texts, the message log."""
 import collections
 import contextlib

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The lab without a daemon: unusual bodies, its page, refusals, uploads and datagrams."""
 import base64
 import gzip

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Log data: the upload of a client's array and the message to the dashboard about it."""
 import json
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The memory that one user can make the daemon keep: all value types, sizes, depths and states, with and without consent,
 with collectors that hang, send huge answers or never answer."""
 import concurrent.futures

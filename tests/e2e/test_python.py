@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The Python client, against a daemon that works, is missing, comes later, stands still, refuses or is killed."""
 import os
 import signal

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The path of a message from a client to the collector, and the commands of veltractl."""
 import json
 import subprocess

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Sessions with several back ends or none: parts of a message, which answer is used, when a flush is answered; edge cases of
 the HTTPS back end: consent, server errors, addresses, internal builds."""
 import json

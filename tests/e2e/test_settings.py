@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """What an administrator says under etc/veltrad: both forms of a file, SIGHUP, settings.json."""
 import os
 import signal

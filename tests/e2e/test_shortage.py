@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Temporary shortages of descriptors and threads, and the environment in which the daemon is started: closed standard
 descriptors, hostile variables. The daemon runs with its sandbox."""
 import contextlib

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Valid and invalid storebags, and servers that fail."""
 import time
 

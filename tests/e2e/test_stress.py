@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Runs hundreds of sessions with few identities, whose clients vanish, for VELTRA_STRESS_SECONDS."""
 import concurrent.futures
 import os

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """File uploads: what is sent, what the server's answer means, and whether the file is removed."""
 import hashlib
 import json

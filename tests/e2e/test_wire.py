@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Hostile bytes on the socket, which must end only the connection of their sender."""
 import contextlib
 import plistlib

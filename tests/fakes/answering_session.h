@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session behind the ipc room that answers each call in some way of its kind. The connection's own thread.
 #pragma once
 

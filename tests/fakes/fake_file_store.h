@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files in memory, on a disk that can fail and fill up. Any thread.
 #pragma once
 

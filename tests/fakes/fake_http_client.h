@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The HTTP client's twin: answers what waits by a function; nobody may post. Any thread.
 #pragma once
 

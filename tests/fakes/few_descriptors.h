@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Takes the process's descriptors away for a while. One at a time, while no other thread needs any.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a machine says of itself, as the test sets it: time, locale, draws, device, preferences. Any thread,
 // but the locale and the draw are set before threads start.
 #pragma once

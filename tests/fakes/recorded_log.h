@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The log of one test, kept: an unexpected warning or error fails the test. One at a time; lines from any
 // thread.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A directory that lives as long as its test. Test thread.
 #pragma once
 

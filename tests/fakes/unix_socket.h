@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Unix sockets in a directory of the test's own. Test thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A bare end of the wire protocol, for the tests of either side of it, and what their threads wait for.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every service's twin in one place, and the real objects that stand on them, for tests of back ends and
 // above.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // XML property lists: every element, what is written, what is refused and where.
 #include <gtest/gtest.h>
 

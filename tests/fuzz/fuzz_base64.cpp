@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Base64 from anyone: what decodes is encoded and decoded again as the same bytes; every input encodes and
 // decodes.
 #include <cstdint>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bytes of a client, through the reader of frames and the decoding of calls. The first byte says in which
 // pieces the rest arrives; the frames must not depend on it.
 #include <algorithm>

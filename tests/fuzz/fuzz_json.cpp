@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // JSON from anyone: what is read is written, in both styles, and read again as the same value. Comments
 // change nothing, and any place can be asked for.
 #include "formats/json.h"

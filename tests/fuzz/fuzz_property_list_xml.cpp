@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // XML property lists from anyone: what is read is written and read again as the same value, in both forms.
 #include "formats/property_list.h"
 #include "same_value.h"

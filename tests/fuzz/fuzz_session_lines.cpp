@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A line of `veltractl session`: whatever it holds, the answer is a command or one line that says what is
 // wrong.
 #include <cstdint>

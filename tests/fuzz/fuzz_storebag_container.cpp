@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a storebag server sends: whatever the bytes are, the one bag that was ever signed is the only one that
 // verifies.
 #include <cstdint>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Stands in for libFuzzer: gives each file of the corpus directories named on the command line to the fuzz
 // target. One thread.
 #include <cstdint>

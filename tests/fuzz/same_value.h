@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Equality for round trips: as Value's, but not-a-number equals itself. Any thread.
 #pragma once
 

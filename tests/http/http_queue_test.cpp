@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue of requests that wait for a connection: what runs next.
 #include "http/http_queue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The record of servers at its bound.
 #include "http/server_records.h"
 

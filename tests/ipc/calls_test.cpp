@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a call must hold, and what becomes of its reply.
 #include "harness.h"
 

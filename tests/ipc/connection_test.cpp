@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How connections begin and end: greeting, refusals, broken frames, descriptors, floods, the stop.
 #include <fcntl.h>
 #include <poll.h>

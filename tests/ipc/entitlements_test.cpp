@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who a peer is, and what the rules let it do.
 #include "ipc/entitlements.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A daemon's door with a recording session behind it, and clients at bare sockets before it.
 #pragma once
 

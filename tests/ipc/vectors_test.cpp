@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The frames of docs/wire-protocol.md, byte for byte, against the code.
 #include <fstream>
 #include <map>

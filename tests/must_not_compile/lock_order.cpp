@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Takes two locks in the order of their ranks; with WRONG_ORDER defined, in the other one, and must not
 // compile.
 #include "daemon/lock_ranks.h"

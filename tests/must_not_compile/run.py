@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Compiles each file unchanged, which must succeed, and with a fault, which must fail with the given error. Also checks that
 every lock has a rank, because the compiler would accept a lock without one in any order."""
 import re

@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """Installs the packages of build/packages in a fresh Debian that runs its own systemd in a chroot, follows the README's "Install"
 section to a first message, tries what the units forbid, upgrades over a running daemon with a client, removes and purges.
 Needs root, cgroup v2 and minutes; fewer with a directory as argument that debootstrap has made before, which is copied. The last

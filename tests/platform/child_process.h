@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A piece of a test in a process of its own. Test thread, while no other runs.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the device says of itself.
 #include <gmock/gmock.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The thread that waits for the disk, so that nobody else does.
 #include "platform/disk_writer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files on a real disk: what a fault leaves behind.
 #include "platform/file_store.h"
 

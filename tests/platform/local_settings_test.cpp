@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Settings files in their two forms: which counts, what is wrong with them and where.
 #include "platform/local_settings.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The log's lines on a real standard error.
 #include "platform/log.h"
 

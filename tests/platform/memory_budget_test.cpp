@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bounds of the accounts, who makes room for whom, and lines that are counted.
 #include "platform/memory_budget.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Preference domains over real files and over a disk with faults.
 #include "platform/preferences.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the sandbox lets the process do.
 #include <arpa/inet.h>
 #include <gmock/gmock.h>

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Flushes that wait for several back ends: which answer is the one, and that nobody is called under the lock.
 #include "session/flush_counters.h"
 

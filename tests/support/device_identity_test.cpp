@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What becomes of the device property service's answers.
 #include "support/device_identity.h"
 

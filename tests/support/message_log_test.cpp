@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The diagnostic message log in a real directory: what is kept, what is deleted, what a fault leaves behind.
 #include "support/message_log.h"
 

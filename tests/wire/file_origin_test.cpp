@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whose reads end by the kernel's word: real mounts are for tests/e2e/test_uploads.py, which can make them.
 #include "wire/file_origin.h"
 

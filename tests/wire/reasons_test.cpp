@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of reasons, and docs/reasons.md, which VELTRA_WRITE=1 test_wire --gtest_filter='Reasons.*'
 // writes.
 #include "wire/reasons.h"

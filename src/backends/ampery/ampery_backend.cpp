@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Turns a message into an event of the energy log.
 #include "backends/ampery/ampery_backend.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // AmperyBackend: writes every message that has a method and a payload to the energy log. The session's
 // thread.
 #pragma once

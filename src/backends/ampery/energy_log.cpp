@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Appends events to the energy log's file.
 #include "backends/ampery/energy_log.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The energy log: registered events, one JSON object per line. Any thread.
 #pragma once
 

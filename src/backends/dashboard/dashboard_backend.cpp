@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Connects a socket as a storebag's section says, and turns messages into datagrams.
 #include "backends/dashboard/dashboard_backend.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // DashboardBackend: sends every message as one UDP datagram to a dashboard and returns it as a text line. The
 // session's thread sends and uploads; the work pool handles what waits after that (network_proc_queue.h).
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Registers, finds and ends queues.
 #include "backends/dashboard/dashboard_queues.h"
 

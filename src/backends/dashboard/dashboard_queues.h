@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queues to dashboards that outlive their back ends: limits their number, and finds those that one-shot
 // messages share. Any thread.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Computes ticks and the progress of the clean-up.
 #include "backends/dashboard/delivery_schedule.h"
 

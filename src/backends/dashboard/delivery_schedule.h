@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Computes when a back end's ticks are due and when its clean-up ends. Not thread-safe.
 #pragma once
 

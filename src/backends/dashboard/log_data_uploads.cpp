@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Archives the array, posts it and returns the location.
 #include "backends/dashboard/log_data_uploads.h"
 

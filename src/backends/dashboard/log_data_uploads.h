@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Uploads arrays of log data. Each upload blocks its caller until the server has answered. Any thread.
 #pragma once
 

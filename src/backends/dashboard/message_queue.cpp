@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends datagrams, again where necessary, and gives them up.
 #include "backends/dashboard/message_queue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The datagrams that wait, and the rules for sending and removing them. Not thread-safe.
 #pragma once
 

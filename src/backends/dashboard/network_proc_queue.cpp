@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sends datagrams, reads acknowledgements and stops when nothing waits.
 #include "backends/dashboard/network_proc_queue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The network side of a dashboard back end: its socket, waiting datagrams and timer. Any thread; ticks and
 // acknowledgements are handled on the work pool.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sorts, escapes and cuts the items of a payload.
 #include "backends/dashboard/packet_text.h"
 

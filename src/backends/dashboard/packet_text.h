@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The text field of a dashboard packet: "key=value" items, shortest values first.
 #pragma once
 

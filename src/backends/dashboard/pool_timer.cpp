@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A timer on Asio's steady clock.
 #include "backends/dashboard/pool_timer.h"
 

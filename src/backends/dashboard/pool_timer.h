@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A timer of the shared pool. Its owner's lock guards it; handlers run on the pool's threads.
 #pragma once
 

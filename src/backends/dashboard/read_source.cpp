@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waits with Asio's reactor.
 #include "backends/dashboard/read_source.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waits on the shared pool until a descriptor can be read. Its owner's lock guards it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The dashboard's packet as it is sent.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps the copies in the order in which they were sent.
 #include "backends/dashboard/sent_copies.h"
 

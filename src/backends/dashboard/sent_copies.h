@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finds the datagram that an acknowledgement answers where several datagrams have the same event number.
 #pragma once
 

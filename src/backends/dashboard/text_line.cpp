@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Prints the fields of a packet.
 #include "backends/dashboard/text_line.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The dashboard text line: one packet in readable form.
 #pragma once
 

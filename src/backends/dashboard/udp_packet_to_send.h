@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A datagram that waits to be sent whole, or to be acknowledged.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // UDP with the system's socket calls.
 #include "backends/dashboard/udp_socket.h"
 

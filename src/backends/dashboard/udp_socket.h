@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A connected IPv4 UDP socket that never blocks.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes a value's text and counts its characters.
 #include "backends/dashboard/value_description.h"
 

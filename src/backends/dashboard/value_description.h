@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The form of a value in a dashboard text: texts unchanged, numbers in decimal, anything else "null".
 #pragma once
 

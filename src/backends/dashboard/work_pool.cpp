@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The shared pool, on Asio.
 #include "backends/dashboard/work_pool.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The process's shared pool of two threads for timers and sockets. Any thread.
 #pragma once
 

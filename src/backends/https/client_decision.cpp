@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides in the order in which a client entry's conditions apply.
 #include "backends/https/client_decision.h"
 

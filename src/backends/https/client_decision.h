@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides whether and how a back end reports for one client entry of its storebag section.
 #pragma once
 

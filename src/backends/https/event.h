@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the event, a flat dictionary, of a message.
 #pragma once
 

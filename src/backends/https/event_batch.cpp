@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps a batch within its bounds.
 #include "backends/https/event_batch.h"
 

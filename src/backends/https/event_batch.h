@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The events that wait for a flush, with their number per method and their size. The owner guards it.
 #pragma once
 

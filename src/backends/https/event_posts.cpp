@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Posts events and handles the answers.
 #include "backends/https/event_posts.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes messages of events, posts them and handles the answers. Any thread; answers come on the HTTP thread.
 #pragma once
 

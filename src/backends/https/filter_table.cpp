@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Applies filters to events.
 #include "backends/https/filter_table.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides which fields of an event may leave the device, and in which form.
 #pragma once
 

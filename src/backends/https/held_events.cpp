@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Guards the batch and keeps its charge up to date.
 #include "backends/https/held_events.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A back end's batch with its memory charge. Any thread: the session's thread adds and takes events; other
 // threads set a new session ID or drop the oldest events for newer ones of the same user.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Posts or batches messages, and flushes batches.
 #include "backends/https/https_post_backend.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // HTTPSPostBackend: posts messages as JSON events, at once or in batches. The session's thread sends and
 // flushes; another session's thread may call setCorrelatedSessionID; answers come on the HTTP thread.
 #pragma once

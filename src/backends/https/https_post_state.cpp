@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Applies the decision on a client entry to the back end.
 #include "backends/https/https_post_state.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whether and how an HTTPS post back end reports for its current client. The session's thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the JSON text that is posted, and its readable copy.
 #pragma once
 

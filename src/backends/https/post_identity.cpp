@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads consent and identifiers from the preferences and the library.
 #include "backends/https/post_identity.h"
 

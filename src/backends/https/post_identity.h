@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The identifier under which a back end posts, and what the user's consent allows.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads post URLs from the preferences and from client entries.
 #include "backends/https/post_links.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The URLs to which a back end posts: from the preferences, else from a client entry.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the headers and the body of a post.
 #include "backends/https/post_request.h"
 

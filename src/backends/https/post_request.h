@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the HTTPS request of a post and evaluates the status of its answer.
 #pragma once
 

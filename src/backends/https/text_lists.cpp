@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Matches texts with lists.
 #include "backends/https/text_lists.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compares names with lists of texts, ignoring letter case.
 #pragma once
 

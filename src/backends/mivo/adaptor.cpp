@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the table of an adaptor bundle and calls its functions.
 #include "backends/mivo/adaptor.h"
 

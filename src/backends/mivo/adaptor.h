@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An adaptor of a code bundle: its class, found by name, and an instance with its operations.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Converts values into the structures of veltra/adaptor.h.
 #include "backends/mivo/adaptor_payload.h"
 

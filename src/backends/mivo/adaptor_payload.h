@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A message's payload in the form that adaptors take.
 #pragma once
 

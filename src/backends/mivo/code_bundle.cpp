@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Checks who could have written the code, and loads it.
 #include "backends/mivo/code_bundle.h"
 

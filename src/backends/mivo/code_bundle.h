@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A code bundle: a directory with a file NAME.so that is loaded at first use. Any thread.
 #pragma once
 

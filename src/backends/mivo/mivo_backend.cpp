@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Passes messages to the adaptor.
 #include "backends/mivo/mivo_backend.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // MivoBackend: passes every message to the adaptor of the system's bundle, on the session's thread, which
 // waits for it.
 #pragma once

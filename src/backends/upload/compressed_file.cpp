@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Uses O_TMPFILE where the file system has it, so the file never has a name.
 #include "backends/upload/compressed_file.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The compressed form of a file: in memory while it is small, else in a file that has no name.
 #pragma once
 

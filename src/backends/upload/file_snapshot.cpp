@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Uses fstat and pread only, which do not depend on a path.
 #include "backends/upload/file_snapshot.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file in the state at the beginning of its upload, read through a descriptor.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Limits how many files are uploaded at the same time. Any thread.
 #pragma once
 

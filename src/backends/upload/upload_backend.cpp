@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compresses and posts a lent file, and handles the server's answer.
 #include "backends/upload/upload_backend.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // UploadBackend: compresses files of the client and posts them to the upload server. The session's thread
 // does all of it and waits for the server.
 #pragma once

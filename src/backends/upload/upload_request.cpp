@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the address and the headers of an upload.
 #include "backends/upload/upload_request.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes answers as JSON.
 #include "tools/ctl/answers.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The answers to calls and the copies of messages, and the lines that veltractl prints for them.
 #pragma once
 

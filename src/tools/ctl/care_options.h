@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The commands of veltractl for those who look after a device.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One child and one pipe.
 #include "tools/ctl/child_output.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What another program prints. One thread.
 #pragma once
 

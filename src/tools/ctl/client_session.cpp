@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes calls through the C interface and waits for their answers.
 #include "tools/ctl/client_session.h"
 

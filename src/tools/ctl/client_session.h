@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session with the daemon, through the C interface. Used by one thread.
 #pragma once
 

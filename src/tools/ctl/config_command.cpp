@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keys and values are judged here before anybody is asked, so that wrong usage is told apart.
 #include "tools/ctl/config_command.h"
 

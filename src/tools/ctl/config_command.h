@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `veltractl config`. The main thread.
 #pragma once
 

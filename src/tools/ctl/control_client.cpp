@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One call at a time, and its reply.
 #include "tools/ctl/control_client.h"
 

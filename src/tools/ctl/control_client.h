@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Questions to the daemon over its control socket. One thread.
 #pragma once
 

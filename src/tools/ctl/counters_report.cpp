@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Formats the daemon's counters.
 #include "tools/ctl/counters_report.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon decides all checks but the first, which is whether it can be asked.
 #include "tools/ctl/doctor_command.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Checks values that a user gives as JSON.
 #include "tools/ctl/given_values.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Values that a user gives as JSON.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waits for a descriptor and for signals.
 #include "tools/ctl/interrupt.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waits that the user can interrupt. Used by one thread; all others must block the signals, as the library's
 // do.
 #pragma once

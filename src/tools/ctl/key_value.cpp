@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Parses KEY=VALUE.
 #include "tools/ctl/key_value.h"
 

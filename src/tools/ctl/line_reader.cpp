@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads lines from a descriptor.
 #include "tools/ctl/line_reader.h"
 

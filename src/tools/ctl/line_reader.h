@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads lines of bounded length from a descriptor.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
 

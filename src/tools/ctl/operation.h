@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The operations of a session, and their names in lines and answers.
 #pragma once
 

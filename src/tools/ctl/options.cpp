@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Parses the command line. Only this file uses CLI11, and it catches its exceptions.
 #include "tools/ctl/options.h"
 

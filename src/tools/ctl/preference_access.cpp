@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Asks the daemon; takes its place where there is none.
 #include "tools/ctl/preference_access.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where veltractl reads and changes preferences: the daemon, or their files while none runs. One thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes whole lines.
 #include "tools/ctl/print.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Prints results on standard output and everything else on standard error. Any thread.
 #pragma once
 

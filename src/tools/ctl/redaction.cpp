@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Line by line, by patterns; private keys before, as they go over lines.
 #include "tools/ctl/redaction.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Takes secrets, and what names people and machines, out of a text that is to be passed on. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One question a storebag, so that a slow server delays its own line alone.
 #include "tools/ctl/refresh_command.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `veltractl refresh`. The main thread.
 #pragma once
 

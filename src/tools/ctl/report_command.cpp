@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Shown first, then written.
 #include "tools/ctl/report_command.h"
 

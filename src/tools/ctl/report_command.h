@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `veltractl report`: what helps to find a fault, in one text. The main thread.
 #pragma once
 

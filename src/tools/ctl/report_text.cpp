@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Section by section.
 #include "tools/ctl/report_text.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes one call and prints its answer.
 #include "tools/ctl/send_command.h"
 

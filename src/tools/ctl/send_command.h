@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `veltractl send`, `one-shot`, `states`, `display-url`, `upload` and `upload-log-data`: one call on its own
 // connection.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs the lines of a session.
 #include "tools/ctl/session_command.h"
 

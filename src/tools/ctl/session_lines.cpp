@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Parses the input lines.
 #include "tools/ctl/session_lines.h"
 

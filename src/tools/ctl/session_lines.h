@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Parses the input lines of `veltractl session`.
 #pragma once
 

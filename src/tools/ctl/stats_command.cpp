@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads and prints the daemon's counters.
 #include "tools/ctl/stats_command.h"
 

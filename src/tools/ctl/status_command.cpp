@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Asks, puts the pages together, prints.
 #include "tools/ctl/status_command.h"
 

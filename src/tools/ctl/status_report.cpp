@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The running daemon's status, for programs and for people.
 #include "tools/ctl/status_report.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reports the progress and the result of an upload.
 #include "tools/ctl/upload_report.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What `veltractl upload` prints on standard error.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the lab's answers and applies rules to them.
 #include "answers.h"
 

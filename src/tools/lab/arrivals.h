@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What arrives at the lab, by kind. Any thread.
 #pragma once
 

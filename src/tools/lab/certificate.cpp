@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes the certificate with OpenSSL.
 #include "certificate.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finds the open TLS connections with callbacks of OpenSSL.
 #include "connections.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Ends one or all of the open TLS connections. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Receives and acknowledges datagrams.
 #include "dashboard.h"
 

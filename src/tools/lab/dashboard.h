@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The lab's dashboard server: receives datagrams and acknowledges them as the rules say, on its own thread.
 #pragma once
 

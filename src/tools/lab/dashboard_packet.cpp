@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads datagrams and makes acknowledgements.
 #include "dashboard_packet.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The dashboard's datagrams: a header of 64 bytes with big-endian numbers, and a text of items " key=value".
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sets up the lab's directory and reads its storebags.
 #include "directory.h"
 

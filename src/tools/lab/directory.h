@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The lab's directory: its certificate, its signing key, and the storebags that a developer edits. Any
 // thread.
 #pragma once

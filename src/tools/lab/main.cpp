@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // veltra-lab: the servers of the system for development and tests.
 #include <CLI/CLI.hpp>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads rules and finds the one for a request.
 #include "misbehaviour.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rules for the lab's misbehaviour, each for the requests below a path. Any thread.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The options and help texts.
 #include "options.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Appends arrivals to the file and keeps the newest lines.
 #include "received.h"
 

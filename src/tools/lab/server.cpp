@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Handles requests on the threads of the HTTP library, which only this file includes.
 #include "server.h"
 

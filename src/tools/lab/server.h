@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The lab's HTTPS server: storebags, the event collector, log data, uploads, control and the live page.
 #pragma once
 

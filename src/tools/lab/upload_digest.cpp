@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Hashes and unpacks an uploaded body.
 #include "upload_digest.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Describes an uploaded body, which is read piece by piece and not kept.
 #pragma once
 

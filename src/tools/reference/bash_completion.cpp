@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The completion for bash. A path is that of a command without the program: "/send", "" for none.
 #include <fmt/format.h>
 

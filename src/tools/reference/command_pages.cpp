@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the manual pages of the programs say about their options and commands.
 #include "tools/reference/command_pages.h"
 

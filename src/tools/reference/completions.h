@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Completions of a command line for the shells, each a complete file.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The completion for fish: a line for each command and option.
 #include <fmt/format.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Turns the comments of a header into paragraphs and its declarations into blocks of code.
 #include "tools/reference/header_page.h"
 

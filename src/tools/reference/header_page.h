@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What libveltra(3) says about the functions, from the comments of their header.
 #pragma once
 

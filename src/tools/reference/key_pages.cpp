@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the manual pages say about keys, client types and reasons.
 #include "tools/reference/key_pages.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the manual pages say about keys, client types and reasons.
 #pragma once
 

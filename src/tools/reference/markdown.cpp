@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes the form of Markdown that both the pages under docs and the manual pages are made from.
 #include "tools/reference/markdown.h"
 

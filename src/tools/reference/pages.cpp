@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The made parts by their names.
 #include "tools/reference/pages.h"
 

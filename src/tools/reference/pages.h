@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reference pages, docs/reference/*.md. Each is written by hand except for its made parts, which stand
 // between the lines "<!-- made: NAME -->" and "<!-- end -->".
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The completion for zsh: a function for each command, which also takes the options of the program.
 #include <fmt/format.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads, checks, signs and shows storebags.
 #include "storebag/commands.h"
 

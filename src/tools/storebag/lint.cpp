@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finds mistakes in a storebag. Like the daemon, it treats a value of the wrong type as absent.
 #include "storebag/lint.h"
 

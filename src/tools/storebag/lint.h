@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finds mistakes in the content of a storebag.
 #pragma once
 

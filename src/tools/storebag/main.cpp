@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // veltra-storebag: makes keys; signs, verifies, shows and checks storebags. The exit status is 0 if done, 1
 // if refused, failed or with findings, 2 for wrong usage.
 #include <CLI/CLI.hpp>

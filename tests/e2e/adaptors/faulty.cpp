@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An adaptor bundle with the fault that FAULT names; tests/e2e/test_adaptor.py has the expected result of
 // each.
 #include <veltra/adaptor.h>

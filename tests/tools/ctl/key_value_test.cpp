@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a word KEY=VALUE of veltractl's command line stands for.
 #include <gtest/gtest.h>
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whom connections trust while the process has no descriptor left.
 #include "http/connections.h"
 

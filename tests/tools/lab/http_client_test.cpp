@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The HTTP client against the lab's real TLS server on loopback.
 #include "http/http_client.h"
 

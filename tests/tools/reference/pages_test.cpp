@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // docs/reference and the completions say what the programs say. VELTRA_WRITE=1 test_tools_reference writes
 // them.
 #include "tools/reference/pages.h"

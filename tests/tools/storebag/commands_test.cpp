@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // veltra-storebag's commands on real files: what it makes, the daemon's own code must take.
 #include "storebag/commands.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What lint says of each key by the tables that the daemon reads with, and of what no key says alone.
 #include "storebag/lint.h"
 
