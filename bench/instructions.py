@@ -30,9 +30,11 @@ def backends(kind, lab):
 def instructions(root, messages):
     """Of a daemon that starts, takes so many messages in one session, and stops."""
     log = root.path / "callgrind.log"
+    (root.path / "run/veltrad").mkdir(parents=True, exist_ok=True)  # callgrind opens its file before the daemon runs
     daemon = Daemon(root, serving=False, env={"VELTRA_LOG": "error"}, wrapper=(
         "valgrind", "--tool=callgrind", f"--callgrind-out-file={root.path}/run/veltrad/callgrind.out", f"--log-file={log}"))
-    wait_until(lambda: pathlib.Path(root.socket).exists(), "the daemon's socket", PATIENCE)
+    wait_until(lambda: pathlib.Path(root.socket).exists() or daemon.popen.poll() is not None, "the daemon's socket", PATIENCE)
+    assert daemon.popen.poll() is None, log.read_text()
     if messages is not None:
         wire = Wire(root)
         wire.socket.settimeout(PATIENCE)

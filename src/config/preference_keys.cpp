@@ -58,7 +58,7 @@ Value none(bool) {
 }
 
 template <bool B>
-Value boolean(bool) {
+Value fixedBoolean(bool) {
   return B;
 }
 
@@ -73,12 +73,13 @@ constexpr const char* kUUID = "UUID";
 constexpr const char* kMade = "made and stored at the first use";
 
 constexpr PreferenceKey kKeys[] = {
-    {kMain, preference::kConsent, Type::boolean, kTrueOrFalse, isAny, "false", boolean<false>, Effect::now,
-     false, "The user's consent to reporting; without it only what overrides consent is reported"},
+    {kMain, preference::kConsent, Type::boolean, kTrueOrFalse, isAny, "false", fixedBoolean<false>,
+     Effect::now, false,
+     "The user's consent to reporting; without it only what overrides consent is reported"},
     {kMain, preference::kEnvironmentType, Type::integer, "0 to 4", isEnvironment,
      "2 on an internal build, else 3", environment, Effect::nextStart, false,
      "Which section of a storebag holds: 1 development, 2 florn_internal, 3 seed, 4 release, 0 none"},
-    {kMain, preference::kForceEventLogging, Type::boolean, kTrueOrFalse, isAny, "false", boolean<false>,
+    {kMain, preference::kForceEventLogging, Type::boolean, kTrueOrFalse, isAny, "false", fixedBoolean<false>,
      Effect::now, false, "Also without consent, a readable copy of posts in environments 1 and 2"},
     {kMain, preference::kPostURL, Type::text, kAddress, isAddress, "none", none, Effect::now, false,
      "Where events are posted, instead of the storebag's addresses"},
@@ -91,7 +92,7 @@ constexpr PreferenceKey kKeys[] = {
     {kMain, preference::kStorebagURL, Type::text, kAddress, isAddress, "the hosts of deployment.plist", none,
      Effect::nextStart, false, "The storebag server; a slash and the storebag's name are put after it"},
     {preference::kTimeDomain, preference::kAutomaticTimeZone, Type::boolean, kTrueOrFalse, isAny, "true",
-     boolean<true>, Effect::now, false,
+     fixedBoolean<true>, Effect::now, false,
      "Whether the time zone is set automatically, which start messages say"},
 };
 

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "config/client_types.h"
+#include "config/preference_keys.h"
 #include "tools/reference/markdown.h"
 #include "wire/reasons.h"
 
@@ -93,6 +94,17 @@ std::string keysOf(const KeyTable& table, const char* unread) {
       if (level == levels.end()) level = levels.insert(levels.end(), {key.inner, {}});
       level->owners.push_back(&key);
     }
+  }
+  return page;
+}
+
+std::string preferences() {
+  std::string page;
+  for (const config::PreferenceKey& key : config::preferenceKeys()) {
+    page += fmt::format("- **{}** ({}, {}; a change takes effect {}): {} Without it: {}\n",
+                        escaped(key.name()), nameOf(key.type), key.range,
+                        key.effect == config::PreferenceKey::Effect::now ? "now" : "at the next start",
+                        sentence(escaped(key.meaning)), sentence(escaped(key.byDefault)));
   }
   return page;
 }

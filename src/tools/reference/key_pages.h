@@ -12,6 +12,7 @@ namespace veltrad::reference {
 // added to the keys that the daemon does not read.
 std::string keysOf(const config::KeyTable& table, const char* unread = "");
 // A table of the client types: number, storebag and sender code.
+std::string preferences();
 std::string clientTypes();
 // A table of the environments: number and section.
 std::string environments();

@@ -42,6 +42,7 @@ constexpr Part kParts[] = {
     {"options of veltra-lab", [] { return optionsOf(lab::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
     {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},
+    {"preferences", preferences},
     {"client types", clientTypes},
     {"environments", environments},
     {"reasons", reasons},
