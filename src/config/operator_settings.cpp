@@ -29,7 +29,7 @@ constexpr Range kBytes{1, kMostBytes};
 constexpr Range kDays{1, 36'500};
 constexpr Range kSeconds{1, 31'536'000};
 
-constexpr std::array kStorebagKeys{
+constexpr std::array kStorebagChoiceKeys{
     row<&StorebagChoices::persist>(
         {"persist", boolean, kUnbounded, optional, "false",
          "Keeps the last good storebag of each name on disk and verifies it again after a restart."})
@@ -91,7 +91,7 @@ constexpr std::array kSettingsKeys{
 
 }  // namespace
 
-constinit const KeyTable StorebagChoices::kKeys{kStorebagKeys};
+constinit const KeyTable StorebagChoices::kKeys{kStorebagChoiceKeys};
 constinit const KeyTable OperatorChoices::kKeys{kSettingsKeys};
 
 void take(const Key&, const Value& value, StorebagChoices& field) {

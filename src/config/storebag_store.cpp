@@ -10,7 +10,7 @@
 namespace veltrad::config {
 namespace {
 
-constexpr std::size_t kMostBytes = kStorebagMostContainerBytes + 65'536;  // room for the keys beside it
+constexpr std::size_t kMostStoredBytes = kStorebagMostContainerBytes + 65'536;  // room for the keys beside it
 
 std::optional<KeptStorebag> keptIn(const std::string& bytes) {
   const auto list = parseBinaryPropertyList(bytes);
@@ -33,7 +33,7 @@ bool StorebagStore::holds(const std::string& name) {
 }
 
 Result<std::optional<KeptStorebag>, platform::FileFailure> StorebagStore::read(const std::string& name) {
-  const auto bytes = _files.read(pathOf(name), kMostBytes);
+  const auto bytes = _files.read(pathOf(name), kMostStoredBytes);
   if (!bytes) {
     if (bytes.error().passes()) return Failure{bytes.error()};
     if (bytes.error().kind != platform::FileFailure::Kind::notFound) remove(name, bytes.error().description);
