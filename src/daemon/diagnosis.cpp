@@ -18,16 +18,16 @@ namespace veltrad::daemon {
 
 namespace {
 
-using Result = Check::Result;
+using Outcome = Check::Result;
 using Cause = config::StorebagCause;
 using Findings = std::vector<StorebagFinding>;
 
 Check ok(const char* name, std::string text) {
-  return {name, Result::ok, std::move(text), ""};
+  return {name, Outcome::ok, std::move(text), ""};
 }
 
 Check skipped(const char* name, std::string why) {
-  return {name, Result::skipped, std::move(why), ""};
+  return {name, Outcome::skipped, std::move(why), ""};
 }
 
 Check checkEntitlement(const EntitlementFacts& facts) {
@@ -35,25 +35,25 @@ Check checkEntitlement(const EntitlementFacts& facts) {
   const std::string rule =
       fmt::format(R"({{"uid": {}, "entitlements": {{"{}": true}}}})", facts.uid, wire::kVeltraEntitlement);
   if (!facts.rules) {
-    return {kName, Result::warning, facts.path + " cannot be read just now", "run the command again"};
+    return {kName, Outcome::warning, facts.path + " cannot be read just now", "run the command again"};
   }
   if (facts.rules->missing) {
-    return {kName, Result::failure, fmt::format("there is no {}, so nobody may report", facts.path),
+    return {kName, Outcome::failure, fmt::format("there is no {}, so nobody may report", facts.path),
             fmt::format("write that file: an array of rules such as {}", rule)};
   }
   if (!facts.rules->error.empty()) {
-    return {kName, Result::failure, facts.rules->error + "; nobody may report",
+    return {kName, Outcome::failure, facts.rules->error + "; nobody may report",
             fmt::format("mend {}: an array of rules such as {}", facts.path, rule)};
   }
   if (!facts.rules->grants) {
     const std::string why = facts.rules->warnings.empty() ? "" : ": " + facts.rules->warnings.front();
     return {
-        kName, Result::failure,
+        kName, Outcome::failure,
         fmt::format("no rule in {} grants \"{}\" to anybody{}", facts.path, wire::kVeltraEntitlement, why),
         fmt::format("add a rule such as {}", rule)};
   }
   if (!facts.granted) {
-    return {kName, Result::warning,
+    return {kName, Outcome::warning,
             fmt::format("{} grants \"{}\" to others, but not to uid {}, which asks", facts.path,
                         wire::kVeltraEntitlement, facts.uid),
             fmt::format("if this user is to report, add a rule such as {}", rule)};
@@ -65,14 +65,14 @@ Check checkAddress(const AddressFacts& facts) {
   constexpr const char* kName = "storebagAddress";
   constexpr const char* kSet = "veltractl config set veltra_storebag_url https://HOST/PATH";
   if (!facts.inUse) {
-    return {kName, Result::warning, "the storebag server's address cannot be read just now",
+    return {kName, Outcome::warning, "the storebag server's address cannot be read just now",
             "run the command again"};
   }
   const std::string shown = escapedForLog(*facts.inUse);
   const bool changed = facts.preferred && *facts.preferred != *facts.inUse;
   if (config::isExampleStorebagURL(*facts.inUse)) {
     if (changed) {
-      return {kName, Result::failure,
+      return {kName, Outcome::failure,
               fmt::format("veltra_storebag_url was set after the daemon had chosen {}, a built-in example",
                           shown),
               "start the daemon again: systemctl restart veltrad"};
@@ -83,16 +83,16 @@ Check checkAddress(const AddressFacts& facts) {
                                       "storebag server",
                                       facts.deploymentPath)
                                 : facts.deploymentProblem;
-    return {kName, Result::failure, fmt::format("{}; {} is a built-in example", why, shown),
+    return {kName, Outcome::failure, fmt::format("{}; {} is a built-in example", why, shown),
             fmt::format("{}, or name the host in {}; then: systemctl restart veltrad", kSet,
                         facts.deploymentPath)};
   }
   if (!facts.inUse->starts_with("https://")) {
-    return {kName, Result::failure, fmt::format("\"{}\" does not begin with https://", shown),
+    return {kName, Outcome::failure, fmt::format("\"{}\" does not begin with https://", shown),
             fmt::format("{}; then: systemctl restart veltrad", kSet)};
   }
   if (changed) {
-    return {kName, Result::warning,
+    return {kName, Outcome::warning,
             fmt::format("{} is in use, and veltra_storebag_url is now {}", shown,
                         escapedForLog(*facts.preferred)),
             "for the new address start the daemon again: systemctl restart veltrad"};
@@ -132,7 +132,7 @@ std::string listed(const Findings& findings, Chosen chosen, std::string (*label)
 Check checkNameResolution(const Findings& findings) {
   constexpr const char* kName = "nameResolution";
   if (const StorebagFinding* finding = findingWith(findings, Cause::resolve)) {
-    return {kName, Result::failure, escapedForLog(finding->answer.why),
+    return {kName, Outcome::failure, escapedForLog(finding->answer.why),
             "see whether the host in veltra_storebag_url is right, and whether this device resolves names"};
   }
   if (!anyAnswered(findings) && findingWith(findings, Cause::noAttempt))
@@ -142,9 +142,9 @@ Check checkNameResolution(const Findings& findings) {
 
 Check checkTrust(const StorebagFacts& facts, const Check& resolved) {
   constexpr const char* kName = "trust";
-  if (resolved.result == Result::failure) return skipped(kName, "the server's name is not resolved");
+  if (resolved.result == Outcome::failure) return skipped(kName, "the server's name is not resolved");
   if (const StorebagFinding* finding = findingWith(facts.findings, Cause::trust)) {
-    return {kName, Result::failure, escapedForLog(finding->answer.why),
+    return {kName, Outcome::failure, escapedForLog(finding->answer.why),
             fmt::format("put the certificate of the authority that signed the server's into {}, in PEM form",
                         facts.certificatesPath)};
   }
@@ -167,11 +167,11 @@ Check checkStorebag(const StorebagFacts& facts, const std::string& address) {
     return skipped(kName, "no storebag could be asked for");
   const StorebagFinding& last = findings.back();
   if (last.answer.cause == Cause::noAttempt) {
-    return {kName, Result::failure, labelled(last),
+    return {kName, Outcome::failure, labelled(last),
             "run the command again, and see the check of descriptors"};
   }
   if (endsAtServer(last.answer.cause)) {
-    return {kName, Result::failure, labelled(last),
+    return {kName, Outcome::failure, labelled(last),
             fmt::format("see whether the storebag server runs and answers at {}", address)};
   }
   const std::string problems = listed(findings, isNoStorebag, labelled);
@@ -184,7 +184,7 @@ Check checkStorebag(const StorebagFacts& facts, const std::string& address) {
         return !isNoStorebag(one) || one.answer.status == 404;
       });
   const bool some = std::any_of(findings.begin(), findings.end(), isGenuine);
-  return {kName, spare && some ? Result::warning : Result::failure, problems, mend};
+  return {kName, spare && some ? Outcome::warning : Outcome::failure, problems, mend};
 }
 
 bool isNotGenuine(const StorebagFinding& finding) {
@@ -198,12 +198,12 @@ std::string quoted(const StorebagFinding& finding) {
 Check checkSignature(const StorebagFacts& facts) {
   constexpr const char* kName = "signature";
   if (const StorebagFinding* without = findingWith(facts.findings, Cause::publicKey)) {
-    return {kName, Result::failure, labelled(*without),
+    return {kName, Outcome::failure, labelled(*without),
             fmt::format("install the public key that storebags are signed for as {}", facts.publicKeyPath)};
   }
   const std::string bad = listed(facts.findings, isNotGenuine, quoted);
   if (!bad.empty()) {
-    return {kName, Result::failure, listed(facts.findings, isNotGenuine, labelled),
+    return {kName, Outcome::failure, listed(facts.findings, isNotGenuine, labelled),
             fmt::format("sign {} with the private key that belongs to {}, or install the publicKey.der that "
                         "belongs to the key it is signed with",
                         bad, facts.publicKeyPath)};
@@ -230,10 +230,10 @@ Check checkEnvironment(const StorebagFacts& facts) {
                             "veltractl config set environmentType 1 to 4",
                             facts.section)
                       : "choose an environment: veltractl config set environmentType 1 to 4";
-    return {kName, Result::failure, missing, mend};
+    return {kName, Outcome::failure, missing, mend};
   }
   if (const std::string names = listed(facts.findings, empty, quoted); !names.empty()) {
-    return {kName, Result::failure,
+    return {kName, Outcome::failure,
             fmt::format("the daemon holds {} as fetched successfully, but without a section: the server says "
                         "\"not modified\" of a storebag that was not kept",
                         names),
@@ -254,7 +254,7 @@ Check checkClientTypes(const StorebagFacts& facts) {
   std::string numbers;
   for (const std::int32_t type : facts.typesWithout)
     numbers += (numbers.empty() ? "" : ", ") + std::to_string(type);
-  return {kName, Result::warning,
+  return {kName, Outcome::warning,
           fmt::format("client types without a storebag, whose sessions never report: {}", numbers),
           "use a client type from 5 to 17"};
 }
@@ -267,26 +267,26 @@ Check checkConsent(Consent consent) {
     case Consent::given:
       return ok(kName, "given");
     case Consent::refused:
-      return {kName, Result::warning,
+      return {kName, Outcome::warning,
               fmt::format("refused: {} is false, so only what needs no consent is reported", kKey),
               fmt::format("the owner's choice; to change it: {}", kGive)};
     case Consent::neverGiven:
-      return {kName, Result::failure,
+      return {kName, Outcome::failure,
               fmt::format("never given: {} is not set, so only what needs no consent is reported", kKey),
               kGive};
     case Consent::noBoolean:
-      return {kName, Result::failure, fmt::format("{} is not a boolean, which counts as refused", kKey),
+      return {kName, Outcome::failure, fmt::format("{} is not a boolean, which counts as refused", kKey),
               kGive};
     case Consent::notKnown:
       break;
   }
-  return {kName, Result::warning, fmt::format("{} cannot be read just now", kKey), "run the command again"};
+  return {kName, Outcome::warning, fmt::format("{} cannot be read just now", kKey), "run the command again"};
 }
 
 Check checkMessageLog(const MachineFacts& facts) {
   constexpr const char* kName = "messageLog";
   if (facts.messageLogProblem.empty()) return ok(kName, facts.messageLogPath);
-  return {kName, Result::failure, facts.messageLogProblem,
+  return {kName, Outcome::failure, facts.messageLogProblem,
           fmt::format("make {} a directory that the daemon's user may write to, with free space",
                       facts.messageLogPath)};
 }
@@ -294,7 +294,7 @@ Check checkMessageLog(const MachineFacts& facts) {
 Check checkSandbox(const MachineFacts& facts) {
   constexpr const char* kName = "sandbox";
   if (facts.sandboxInForce) return ok(kName, facts.sandboxLine);
-  return {kName, Result::warning, facts.sandboxLine,
+  return {kName, Outcome::warning, facts.sandboxLine,
           "use a kernel with Landlock (5.13 or newer, \"landlock\" in its lsm= list)"};
 }
 
@@ -302,13 +302,13 @@ Check checkDescriptors(const MachineFacts& facts) {
   constexpr const char* kName = "descriptors";
   const std::string mend = fmt::format("in the unit of veltrad: LimitNOFILE={}", facts.descriptorsNeeded);
   if (facts.descriptors < kFewestDescriptors) {
-    return {kName, Result::failure,
+    return {kName, Outcome::failure,
             fmt::format("{} at most, and a daemon with a few clients needs {}", facts.descriptors,
                         kFewestDescriptors),
             mend};
   }
   if (facts.descriptors < facts.descriptorsNeeded) {
-    return {kName, Result::warning,
+    return {kName, Outcome::warning,
             fmt::format("{} at most; for as many connections as are allowed it takes {}", facts.descriptors,
                         facts.descriptorsNeeded),
             mend};
@@ -326,14 +326,14 @@ std::string dateOf(double secondsSince1970) {
 Check checkClock(double now) {
   constexpr const char* kName = "clock";
   if (now >= kEarliestTime) return ok(kName, dateOf(now));
-  return {kName, Result::failure,
+  return {kName, Outcome::failure,
           fmt::format("{} is before this program was made, and certificates seem not valid yet", dateOf(now)),
           "set the clock: timedatectl set-ntp true"};
 }
 
 // The checks on the way to a storebag in use.
 void diagnoseServer(const StorebagFacts& storebags, const AddressFacts& address, std::vector<Check>& checks) {
-  const bool noAddress = checks.back().result == Result::failure || !address.inUse;
+  const bool noAddress = checks.back().result == Outcome::failure || !address.inUse;
   if (noAddress || storebags.findings.empty()) {
     const std::string why =
         noAddress ? "there is no storebag server to ask" : "no client type that was asked for has a storebag";
@@ -355,7 +355,7 @@ bool endsAtServer(config::StorebagCause cause) {
          cause == Cause::trust || cause == Cause::noAnswer;
 }
 
-const char* nameOf(Check::Result result) {
+const char* nameOf(Check::Outcome result) {
   constexpr const char* kNames[] = {"ok", "warning", "failure", "skipped"};
   return kNames[static_cast<std::size_t>(result)];
 }

@@ -34,7 +34,7 @@ namespace veltrad::ctl {
 
 namespace {
 
-constexpr std::size_t kLargestFile = 1u << 20;
+constexpr std::size_t kLargestReportedFile = 1u << 20;
 constexpr std::size_t kMostFiles = 100;
 constexpr const char* kLogLines = "200";
 // Each storebag may be fetched.
@@ -59,7 +59,7 @@ std::string doctorSection(const Options& options) {
 }
 
 std::string statsSection(const platform::Root& root) {
-  const auto file = platform::DiskFileStore().read(root.countersPath(), kLargestFile);
+  const auto file = platform::DiskFileStore().read(root.countersPath(), kLargestReportedFile);
   if (!file) return cannot(file.error().description);
   const auto counters = readCounters(file.value());
   return counters ? formatCounters(*counters) : cannot(root.countersPath() + " holds no counters");
@@ -97,7 +97,7 @@ Dictionary deviceFacts(const Dictionary& all) {
 // The content of what the daemon would parse; of certificates, keys and what cannot be parsed only that it is
 // there: nobody could say what stands in it.
 std::string contentOf(const std::string& path, const std::string& name, const Redaction& redaction) {
-  const auto bytes = platform::DiskFileStore().read(path, kLargestFile);
+  const auto bytes = platform::DiskFileStore().read(path, kLargestReportedFile);
   if (!bytes) return cannot(bytes.error().description);
   const std::string size = fmt::format("{} bytes", bytes.value().size());
   if (!name.ends_with(".plist") && !name.ends_with(".json")) return cannot(size + ", no property list");
@@ -135,7 +135,7 @@ std::string filesSection(const platform::Root& root, const Redaction& redaction)
 }
 
 std::string distribution() {
-  const auto file = platform::DiskFileStore().read("/etc/os-release", kLargestFile);
+  const auto file = platform::DiskFileStore().read("/etc/os-release", kLargestReportedFile);
   constexpr std::string_view kKey = "PRETTY_NAME=";
   const std::string text = file ? "\n" + file.value() : std::string();
   const std::size_t at = text.find("\n" + std::string(kKey));
