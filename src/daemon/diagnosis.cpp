@@ -355,7 +355,7 @@ bool endsAtServer(config::StorebagCause cause) {
          cause == Cause::trust || cause == Cause::noAnswer;
 }
 
-const char* nameOf(Check::Outcome result) {
+const char* nameOf(Check::Result result) {
   constexpr const char* kNames[] = {"ok", "warning", "failure", "skipped"};
   return kNames[static_cast<std::size_t>(result)];
 }
