@@ -118,14 +118,15 @@ def git(*arguments):
     return done.stdout.split() if done.returncode == 0 else []
 
 
-def changed_files():
-    """What differs from the commit where this branch left origin/main or, on main itself and without a remote, from the
-    commit before this one. None: there is no such commit."""
-    base = git("merge-base", "HEAD", "origin/main")
-    if not base or base == git("rev-parse", "HEAD"):
+def changed_files(given=None):
+    """What differs from the given commit, else from the commit where this branch left origin/main or, on main itself and
+    without a remote, from the commit before this one. Nothing, which is said, where there is no such commit."""
+    base = git("rev-parse", "--verify", given) if given else git("merge-base", "HEAD", "origin/main")
+    if not given and (not base or base == git("rev-parse", "HEAD")):
         base = git("rev-parse", "--verify", "HEAD~1")
     if not base:
-        return None
+        print("no commit to compare with: run scripts/check for the lint of all sources")
+        return set()
     return set(git("diff", "--name-only", *base) + git("ls-files", "--others", "--exclude-standard"))
 
 
@@ -194,10 +195,10 @@ def main():
     arguments = [argument for argument in sys.argv[1:] if argument != "--add-license"]
     if arguments == ["--no-lint"]:
         del checks["lint"]
-    elif arguments == ["--changed"]:
-        checks = {"lint of what changed": lambda: check_lint(changed_files())}
+    elif arguments[:1] == ["--changed"] and len(arguments) <= 2:
+        checks = {"lint of what changed": lambda: check_lint(changed_files(*arguments[1:]))}
     elif arguments:
-        sys.exit(f"scripts/check: unknown argument {arguments[0]}; expected --no-lint or --changed")
+        sys.exit(f"scripts/check: unknown argument {arguments[0]}; expected --no-lint or --changed [COMMIT]")
     failed = 0
     for name, check in checks.items():
         found = check()
