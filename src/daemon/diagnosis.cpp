@@ -11,6 +11,7 @@
 
 #include "base/text.h"
 #include "base/version.h"
+#include "config/preference_keys.h"
 #include "config/process_settings.h"
 #include "wire/constants.h"
 
@@ -261,7 +262,7 @@ Check checkClientTypes(const StorebagFacts& facts) {
 
 Check checkConsent(Consent consent) {
   constexpr const char* kName = "consent";
-  constexpr const char* kKey = "DiagnosticLogSubmissionEnabled";
+  constexpr const char* kKey = config::preference::kConsent;
   constexpr const char* kGive = "veltractl config set DiagnosticLogSubmissionEnabled true";
   switch (consent) {
     case Consent::given:

@@ -9,6 +9,7 @@
 
 #include "base/version.h"
 #include "config/client_types.h"
+#include "config/preference_keys.h"
 #include "config/process_settings.h"
 #include "daemon/storebag_cache.h"
 #include "http/http_queue.h"
@@ -82,7 +83,7 @@ EntitlementFacts Doctor::entitlementOf(ipc::Connection& caller) {
 AddressFacts Doctor::address() {
   auto inUse = _settings.storebagServerURL();
   return {std::move(inUse),
-          _services.preferences.text(platform::kVeltraPreferenceDomain, "veltra_storebag_url"),
+          _services.preferences.text(platform::kVeltraPreferenceDomain, config::preference::kStorebagURL),
           _services.root.deploymentPath(), _settings.deploymentProblem()};
 }
 
@@ -110,7 +111,7 @@ StorebagFacts Doctor::storebags(StorebagCache& cache, const std::vector<std::int
 
 Consent Doctor::consent() {
   const auto stored =
-      _services.preferences.lookUp(platform::kVeltraPreferenceDomain, "DiagnosticLogSubmissionEnabled");
+      _services.preferences.lookUp(platform::kVeltraPreferenceDomain, config::preference::kConsent);
   if (!stored) return Consent::notKnown;
   if (!stored.value()) return Consent::neverGiven;
   const auto given = stored.value()->toBoolean();

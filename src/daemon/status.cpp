@@ -11,6 +11,7 @@
 #include <limits>
 #include <memory>
 
+#include "base/text.h"
 #include "base/version.h"
 #include "config/client_types.h"
 #include "daemon/veltrad_agent.h"
@@ -27,8 +28,12 @@ Value numberOrNull(const std::optional<double>& number) {
   return number.value_or(kNotKnown);
 }
 
+// Clients choose their names and may choose long ones: a reply must hold those of many sessions.
+constexpr std::size_t kLongestText = 256;  // bytes
+
 Value textOrNull(const std::string* text) {
-  return text ? Value(*text) : Value(kNotKnown);
+  if (!text) return kNotKnown;
+  return withoutIncompleteEnd(std::string_view(*text).substr(0, kLongestText));
 }
 
 Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now) {

@@ -50,7 +50,8 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers);
 // The sessions that came after number `after`, in the order of arrival, as many as one reply can carry:
 // {"sessions": [{"id", "parent", "clientType", "sessionID", "clientName", "serviceName", "backends":
 // [{"name", "state", "reason": {"name", "text"}, "held", "underWay", "lastOutcome"}]}], "more": true where
-// there are others}. "id" is the number, "parent" that of the parent session, if there is one.
+// there are others}. "id" is the number, "parent" that of the parent session, if there is one. Of a name, the
+// first 256 bytes.
 Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after);
 
 }  // namespace veltrad::daemon

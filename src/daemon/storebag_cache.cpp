@@ -53,8 +53,9 @@ config::StorebagAnswer StorebagCache::refresh(std::int32_t clientType) {
     settledRecord(name).beingFetched = true;
   }
   config::StorebagSectionAnswer answer = fetched(clientType, name, std::nullopt);
-  config::StorebagAnswer told = answer;
   const Lock held(_lock);
+  settle(_cachedStorebags[name]);  // first, because the copy may find no memory
+  config::StorebagAnswer told = answer;
   taken(clientType, _cachedStorebags[name], std::move(answer));
   return told;
 }

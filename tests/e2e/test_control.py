@@ -5,7 +5,7 @@ import os
 import subprocess
 import unittest
 
-from harness import DEADLINE, ENTITLEMENT, SystemTest, program, storebag, wait_until
+from harness import DEADLINE, ENTITLEMENT, SystemTest, Wire, program, storebag, wait_until
 
 OBSERVE, CONTROL = "com.florn.veltrad.observe", "com.florn.veltrad.control"
 NOBODY = 65534
@@ -83,9 +83,14 @@ class Control(SystemTest):
             tree = self.status()["sessions"]
             self.assertEqual([(one["sessionID"], [below["sessionID"] for below in one["children"]]) for one in tree],
                              [(42, [43])])
-            many = [self.started() for _ in range(230)]
+            for first in "ab":  # two names that would fill a reply must not keep the others from being seen
+                long = Wire(self.root)
+                self.addCleanup(long.close)
+                long.describe(user_info={"clientName": first + "\u00e9" * 400_000})
+            many = [self.started() for _ in range(228)]
             self.assertEqual(len(self.status()["sessions"]), 231)
             self.assertEqual(len({one["sessionID"] for one in self.status()["sessions"]}), 2)
+            self.assertIn("a" + "\u00e9" * 127, [one["clientName"] for one in self.status()["sessions"]])
             for one in many:
                 one.close()
             root.close()
