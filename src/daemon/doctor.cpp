@@ -22,7 +22,7 @@ namespace {
 
 // A socket and a wake-up descriptor for each of 4,096 clients and 64 observers; a socket for each post under
 // way and for each of 256 dashboards; 64 for files, the log, certificates and the libraries.
-constexpr std::uint64_t kDescriptorsNeeded = 2 * (4'096 + 64) + http::HTTPQueue::kMostEvents + 256 + 64;
+constexpr std::uint64_t kDescriptorsNeeded = 2ULL * (4'096 + 64) + http::HTTPQueue::kMostEvents + 256 + 64;
 
 struct Names {
   std::map<std::string, std::int32_t> types;  // one client type for each name

@@ -7,9 +7,8 @@
 #include <unistd.h>
 
 #include <cmath>
-#include <cstdio>
+#include <fstream>
 #include <limits>
-#include <memory>
 
 #include "base/text.h"
 #include "base/version.h"
@@ -80,11 +79,10 @@ Dictionary statusOfSession(const ListedSession& listed) {
 }  // namespace
 
 std::uint64_t residentBytes() {
-  const std::unique_ptr<FILE, int (*)(FILE*)> file(std::fopen("/proc/self/statm", "re"), std::fclose);
-  unsigned long whole = 0;
-  unsigned long resident = 0;
-  if (!file || std::fscanf(file.get(), "%lu %lu", &whole, &resident) != 2) return 0;
-  return std::uint64_t{resident} * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
+  std::uint64_t whole = 0;
+  std::uint64_t resident = 0;  // in pages
+  if (!(std::ifstream("/proc/self/statm") >> whole >> resident)) return 0;
+  return resident * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
 }
 
 Limit descriptorLimit() {
