@@ -7,8 +7,10 @@
 #include <unistd.h>
 
 #include <cmath>
-#include <fstream>
+#include <cstdio>
+#include <cstdlib>
 #include <limits>
+#include <memory>
 
 #include "base/text.h"
 #include "base/version.h"
@@ -79,10 +81,14 @@ Dictionary statusOfSession(const ListedSession& listed) {
 }  // namespace
 
 std::uint64_t residentBytes() {
-  std::uint64_t whole = 0;
-  std::uint64_t resident = 0;  // in pages
-  if (!(std::ifstream("/proc/self/statm") >> whole >> resident)) return 0;
-  return resident * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
+  // Two numbers of pages: the whole size and what is resident. A stream of the library would not be
+  // close-on-exec.
+  const std::unique_ptr<FILE, int (*)(FILE*)> file(std::fopen("/proc/self/statm", "re"), std::fclose);
+  char text[64];
+  if (!file || !std::fgets(text, sizeof text, file.get())) return 0;
+  char* resident = nullptr;
+  static_cast<void>(std::strtoull(text, &resident, 10));
+  return std::strtoull(resident, nullptr, 10) * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
 }
 
 Limit descriptorLimit() {
