@@ -170,7 +170,7 @@ class Family(HTTPSTest):
         with self.serving(PROXY), open(self.root.path / "file", "w+b") as file:
             file.write(b"lent")
             file.flush()
-            root, child = self.join(ROOT, aggregates=True), self.join(CHILD)
+            root, child = self.join(ROOT, aggregates=True), self.join(CHILD, batch=True)
             root.send(Wire.CALL, {"op": UPLOAD, "args": {"path": "/lent"}}, 777, 1, [file.fileno()])
             self.lab.received("uploads", 1)
             for length in (*[1000] * 1300, *range(1000, -1, -1)):  # until none of any size is taken
