@@ -25,14 +25,14 @@ void VeltraBackend::updateState() {
   setState({kBackendReporting, wire::Reason::always});
 }
 
-std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
+std::optional<std::string> VeltraBackend::sendMessage(std::optional<Dictionary> payload,
                                                       platform::TimeValue timestamp, std::uint16_t method,
                                                       std::uint16_t respCode, std::int32_t flag) {
   ++_eventID;
-  return sendNumberedMessage({payload, timestamp, method, respCode, _eventID, flag});
+  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag});
 }
 
-std::optional<std::string> VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
+std::optional<std::string> VeltraBackend::sendNumberedMessage(NumberedMessage&&) {
   return std::nullopt;
 }
 

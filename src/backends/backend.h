@@ -46,9 +46,8 @@ struct BackendActivity {
   std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
 };
 
-// The payload may be null.
 struct NumberedMessage {
-  const Dictionary* payload = nullptr;
+  std::optional<Dictionary> payload;
   platform::TimeValue timestamp;
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
@@ -73,9 +72,10 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual void updateState();
 
   // Numbers the message (1, 2, … 65535, 0, …) and passes it on. Returns a text about what was sent.
-  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+  std::optional<std::string> sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp,
                                          std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
-  virtual std::optional<std::string> sendNumberedMessage(const NumberedMessage& message);
+  // May take the payload out of the message, so that nothing in it needs to be copied.
+  virtual std::optional<std::string> sendNumberedMessage(NumberedMessage&& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);

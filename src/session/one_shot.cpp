@@ -36,7 +36,8 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   const platform::TimeValue time = making.clock.now();
   for (const auto& [name, backend] : *set) {
     backend->updateState();
-    const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    const auto answer = backend->sendMessage(message.payload ? std::optional(*message.payload) : std::nullopt,
+                                             time, message.category, message.type, 0);
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();

@@ -188,41 +188,31 @@ void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                              wire::OptionalDictionary payload, wire::StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(category, type, std::move(payload));
+  const auto answer = sendMessageWithCategory(category, type, std::move(payload), Origin::client);
   if (reply) reply(answer);
 }
 
 void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::StringReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithDictionary(message, Origin::client);
+  const auto answer = sendMessageWithDictionary(std::move(message));
   if (reply) reply(answer);
 }
 
 void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
   logDebug("finishSessionWithReply: Finishing session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
+  const auto answer = sendMessageWithCategory(0, 2, std::nullopt, Origin::client);
   if (reply) reply(answer);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
                                                                    Origin origin) {
-  Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
-                     {wire::kVeltraMessageParametersFlag, 0u},
-                     {wire::kVeltraMessageParametersType, unsigned{type}}};
-  if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
-  return sendMessageWithDictionary(message, origin);
+  if (!hasBackends(origin)) return std::nullopt;
+  return sendMessage({std::move(payload), {}, category, type, 0});
 }
 
-std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
-                                                                     Origin origin) {
-  if (!_backends) {
-    logDebug("sendMessageWithDictionary: No backends available to send message");
-    if (origin == Origin::client) {
-      _services.counters.count(wire::Reason::no_backends);
-    }
-    return std::nullopt;
-  }
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary message) {
+  if (!hasBackends(Origin::client)) return std::nullopt;
   const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
@@ -235,23 +225,34 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
     _services.counters.count(wire::Reason::no_type);
     return std::nullopt;
   }
-  const auto category16 = static_cast<std::uint16_t>(*category);
-  const auto type16 = static_cast<std::uint16_t>(*type);
-  const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
-  const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
-  const platform::TimeValue time = _services.clock.now();
+  const auto flag = message.uint32(wire::kVeltraMessageParametersFlag).value_or(0);
+  return sendMessage({message.takeDictionary(wire::kVeltraMessageParametersPayload),
+                      {},
+                      static_cast<std::uint16_t>(*category),
+                      static_cast<std::uint16_t>(*type),
+                      static_cast<std::int32_t>(flag)});
+}
+
+bool VeltradSession::hasBackends(Origin origin) const {
+  if (_backends) return true;
+  logDebug("sendMessageWithDictionary: No backends available to send message");
+  if (origin == Origin::client) _services.counters.count(wire::Reason::no_backends);
+  return false;
+}
+
+// Sets the message's time. There are back ends.
+std::optional<std::string> VeltradSession::sendMessage(Message message) {
+  message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
   sayWithoutUserInfo();
   const std::int32_t hierarchy = hierarchyOf(_backends.get());
-  if (hierarchy > 0 || _aggregation->active()) {
-    aggregateMessage(hierarchy, platform::timevalToSeconds(time), category16, type16, payload);
-  }
-  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog);
+  if (hierarchy > 0 || _aggregation->active()) aggregateMessage(hierarchy, message);
+  return offerToBackends(*_backends, std::move(message), _services.messageLog);
 }
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), Origin::session);
+  sendMessageWithCategory(method, respCode, payload, Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
@@ -263,13 +264,14 @@ void VeltradSession::sayWithoutUserInfo() {
   logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", _sessionID);
 }
 
-void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category,
-                                      std::uint16_t type, const Dictionary* payload) {
+void VeltradSession::aggregateMessage(std::int32_t hierarchy, const Message& message) {
   const FamilyPlace place{*_aggregation, _userInfo, hierarchy};
   // A root has no ancestors, so it does not need the families' lock.
   const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
   if (!toAncestor && !_aggregation->active()) return;
-  const std::string copy = aggregatedCopy(_sessionInfo, _userInfo, timestamp, category, type, payload);
+  const std::string copy =
+      aggregatedCopy(_sessionInfo, _userInfo, platform::timevalToSeconds(message.time), message.category,
+                     message.type, message.payload ? &*message.payload : nullptr);
   CopySent sent;
   if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
   if (!sent.taken) sent = _aggregation->sendToAggregator(copy);

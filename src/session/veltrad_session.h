@@ -27,6 +27,7 @@ class Aggregation;
 class FlushCounters;
 class VeltradSessionDelegate;
 struct FamilyFacts;
+struct Message;
 
 // What every session uses. It outlives the sessions.
 struct SessionServices {
@@ -88,15 +89,15 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void keepUserInfo(backends::SharedDictionary info);
   // Messages of the session itself are not counted as lost.
   enum class Origin { client, session };
-  // These check the message, pass it to the aggregating client and every back end, and return the answer for
-  // the client.
+  bool hasBackends(Origin origin) const;
+  // These check the message and return the answer for the client.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                                     wire::OptionalDictionary payload,
-                                                     Origin origin = Origin::client);
-  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, Origin origin);
+                                                     wire::OptionalDictionary payload, Origin origin);
+  std::optional<std::string> sendMessageWithDictionary(Dictionary message);
+  // Passes the message to the aggregating client and every back end.
+  std::optional<std::string> sendMessage(Message message);
   void sayWithoutUserInfo();
-  void aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category, std::uint16_t type,
-                        const Dictionary* payload);
+  void aggregateMessage(std::int32_t hierarchy, const Message& message);
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
 
   FamilyFacts familyFacts() const;

@@ -22,13 +22,13 @@ AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters,
                              const std::string& name, const std::string& productFamily)
     : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
-std::optional<std::string> AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
+std::optional<std::string> AmperyBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (message.method == 0 || !message.payload || message.payload->empty()) {
     _counters.count(message.method == 0 ? wire::Reason::energy_category_zero
                                         : wire::Reason::energy_payload_empty);
     return std::nullopt;
   }
-  Dictionary event = *message.payload;
+  Dictionary event = *std::move(message.payload);
   event.merge({{"event", unsigned{message.eventID}},
                {"method", unsigned{message.method}},
                {"respCode", unsigned{message.respCode}}});

@@ -145,7 +145,7 @@ DashboardBackend::~DashboardBackend() {
   cleanup();
 }
 
-std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
+std::optional<std::string> DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   tagReportingPacket packet;
   packet.header = headerOf(message);
   PacketText text(packet.text);
@@ -185,7 +185,7 @@ bool DashboardBackend::uploadLogData(const Array& logData) {
   const auto location = _uploads.upload(_postURL, logData);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
-  sendMessage(&payload, _clock.now(), 0, 2, 0);
+  sendMessage(payload, _clock.now(), 0, 2, 0);
   return true;
 }
 

@@ -54,7 +54,7 @@ class DashboardBackend final : public VeltraBackend {
   ~DashboardBackend() override;
 
   // Returns the dashboard text line of the message.
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  std::optional<std::string> sendNumberedMessage(NumberedMessage&& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
 

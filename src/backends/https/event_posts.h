@@ -34,8 +34,9 @@ class EventPosts {
 
   // Removes and counts fields that JSON cannot represent.
   void restrict(Dictionary& event) const;
+  // The events have been restricted. `expectedBytes` as for writeJSON.
   JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
-                                             bool wantPretty) const;
+                                             bool wantPretty, std::size_t expectedBytes) const;
   // The post keeps the back end alive. A status of 5xx disables the back end.
   void postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
                        const std::optional<std::string>& url, Post post);

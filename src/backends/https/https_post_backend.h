@@ -35,7 +35,7 @@ class HTTPSPostBackend final : public VeltraBackend {
       const std::optional<std::string>& productFamily);
 
   void updateState() override;
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  std::optional<std::string> sendNumberedMessage(NumberedMessage&& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
   BackendActivity activity() const override;
@@ -44,7 +44,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
                    std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
-  Dictionary withStopFields(const Dictionary& payload, bool batching) const;
+  void addStopFields(Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;
   std::optional<std::string> batchEvent(Dictionary event, platform::MemoryAccount* account,
                                         std::uint64_t sessionIDChanges);
@@ -52,7 +52,9 @@ class HTTPSPostBackend final : public VeltraBackend {
                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   std::optional<std::string> postEvent(Dictionary event, const SessionFacts& facts,
                                        const NumberedMessage& message);
-  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const;
+  // `eventBytes` is an upper bound on the events' JSON texts.
+  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
+                            std::size_t eventBytes) const;
 
   platform::Locale& _locale;
   platform::Counters& _counters;

@@ -36,15 +36,15 @@ void MivoBackend::loadAdaptor() {
   if (!_mivoAdaptor) logWarning("MivoBackend(initWithName): no Mivo adaptor: %s", failure.c_str());
 }
 
-std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
+std::optional<std::string> MivoBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
     _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
     return std::nullopt;
   }
-  const auto thrown =
-      _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode, message.payload);
+  const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode,
+                                            message.payload ? &*message.payload : nullptr);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
