@@ -22,6 +22,8 @@ struct Argument {
   std::string group;
   std::string help;
   std::string byDefault;
+  // The values that there are, where completions shall offer them.
+  std::vector<std::string> choices;
   bool positional = false;
   bool required = false;
   bool repeated = false;
