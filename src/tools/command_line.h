@@ -38,6 +38,9 @@ struct CommandLine {
   std::vector<CommandLine> commands;
 };
 
+// Help shows commands, values, ranges and defaults as manual pages do. Before commands are added.
+void useManualStyle(CLI::App& app);
+
 // Without the help option of commands.
 CommandLine commandLineOf(const CLI::App& app);
 
