@@ -27,6 +27,9 @@ namespace veltra {
 // ---- Answers ----
 
 using Status = veltra_status;
+using ClientType = veltra_client_type;
+using Flag = veltra_flag;
+using MessageKind = veltra_message_kind;
 using Statistics = veltra_statistics;
 
 struct Error {
@@ -114,7 +117,7 @@ struct Aggregated {
 
 // Absent values are left out of the description of the session.
 struct Options {
-  // 0 to 17.
+  // 0 to 17: a ClientType.
   std::optional<std::int32_t> clientType = {};
   std::optional<std::uint32_t> sessionID = {};
   std::optional<std::uint16_t> clientVersion = {};
@@ -132,6 +135,8 @@ struct Options {
   std::size_t queueBytes = 0;
   // Does not describe the session on connecting: for one-shot messages.
   bool undescribed = false;
+  // An array of names, or nothing.
+  Value frameworksToCheck = {};
 };
 
 // A session. If it could not be made, it is false, error() says why, and it refuses every call.
@@ -181,7 +186,15 @@ class Session {
     return wait(&veltra_session_send_wait, category, type, payload.get(), flag);
   }
 
-  // These do not wait. flag: 1 and 3 are realtime, 2 and 3 override sampling.
+  // Describes the live session anew, with the session info, user info and frameworks of `who`. It ends its
+  // aggregation if `who` has no handler; the handler itself stays. Does not wait.
+  Status describe(const Options& who) {
+    veltra_session_options plain = identityOf(who);
+    plain.aggregated = who.aggregated ? &onAggregated : nullptr;
+    return veltra_session_describe(_session, &plain);
+  }
+
+  // These do not wait. flag: 0 to 3, see Flag.
   std::future<Reply> send(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
                           std::uint32_t flag = 0) {
     return promised(
@@ -263,6 +276,7 @@ class Session {
     plain.user_info = options.userInfo.get();
     plain.client_name = text(options.clientName);
     plain.service_name = text(options.serviceName);
+    plain.frameworks_to_check = options.frameworksToCheck.get();
     return plain;
   }
   static std::unique_ptr<Handler> sharedHandler(const Handler& handler) {

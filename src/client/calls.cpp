@@ -4,6 +4,7 @@
 
 #include "base/property_list.h"
 #include "base/text.h"
+#include "client/session_options.h"
 #include "wire/constants.h"
 #include "wire/frame.h"
 #include "wire/limits.h"
@@ -91,6 +92,7 @@ CallFrame callFrame(const char* operation, Entries arguments) {
 
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag) {
+  if (auto problem = problemOfFlag(flag)) return {VELTRA_INVALID, {}, nullptr, std::move(*problem)};
   if (const auto status = verdictOn(payload); status != VELTRA_OK) return {status, {}};
   Entries message;
   message.reserve(4);
@@ -116,6 +118,10 @@ CallFrame statesFrame(const veltra_value* userInfo) {
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
   if (const auto status = verdictOn(options.user_info); status != VELTRA_OK) return {status, {}};
   Entries arguments = identity(options);
+  if (options.frameworks_to_check) {
+    if (!fits(*options.frameworks_to_check)) return {VELTRA_TOO_LARGE, {}};
+    arguments.emplace_back(key::kFrameworksToCheck, valueOfNode(*options.frameworks_to_check));
+  }
   arguments.emplace_back(key::kHasAggregationBlock, options.aggregated != nullptr);
   return callFrame(operation::kSetSessionInfo, std::move(arguments));
 }

@@ -24,10 +24,12 @@ struct CallFrame {
   std::string frame;
   // Of an upload.
   std::shared_ptr<UploadedFile> file = nullptr;
+  // What is wrong with an argument, if the status does not say enough.
+  std::string problem = {};
 };
 
 CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});
-// `payload` is a dictionary or null. A message with a flag is sent as a message dictionary.
+// `payload` is a dictionary or null, `flag` is 0 to 3. A message with a flag is sent as a message dictionary.
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag);
 CallFrame messageDictionaryFrame(const veltra_value* message);

@@ -6,6 +6,7 @@
 #include "client/calls.h"
 #include "client/daemon_connection.h"
 #include "client/daemon_socket.h"
+#include "client/session_options.h"
 #include "wire/names.h"
 #include "wire/socket_path.h"
 
@@ -19,6 +20,8 @@ using veltrad::Dictionary;
 
 struct veltra_session {
   std::shared_ptr<client::DaemonConnection> connection;
+  // It was made with a callback for copies.
+  bool mayAggregate;
 };
 
 namespace {
@@ -63,7 +66,7 @@ veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltr
     answer = connection->sendAndWait(std::move(call.frame), std::move(call.file));
     client::settleUpload(*answer);
   } else {
-    answer = client::answerOfStatus(status);
+    answer = client::answerOfStatus(status, call.problem.empty() ? nullptr : call.problem.c_str());
   }
   const veltra_status result = answer->status;
   if (reply) *reply = answer.release();
@@ -72,33 +75,30 @@ veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltr
 
 client::CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
                           const veltra_value* payload) {
-  if (!who || who->size < sizeof *who) return {VELTRA_INVALID, {}};
-  return client::oneShotFrame(*who, category, type, payload);
+  const auto options = client::completeOptions(who);
+  if (!options) return {VELTRA_INVALID, {}};
+  return client::oneShotFrame(*options, category, type, payload);
 }
 
 }  // namespace
 
-void veltra_session_options_init(veltra_session_options* options) {
-  if (!options) return;
-  *options = veltra_session_options{};
-  options->size = sizeof *options;
-}
-
-veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
+veltra_session* veltra_session_create(const veltra_session_options* given, veltra_status* status,
                                       char** error) {
   if (status) *status = VELTRA_OK;
   if (error) *error = nullptr;
-  if (!options || options->size < sizeof *options) {
+  const auto options = client::completeOptions(given);
+  if (!options) {
     return failed(VELTRA_INVALID,
                   "The session's options were not set up: call veltra_session_options_init first.", status,
                   error);
   }
+  if (const auto problem = client::problemOfDescription(*options)) {
+    return failed(VELTRA_INVALID, *problem, status, error);
+  }
   const client::CallFrame description = client::sessionInfoFrame(*options);
   if (description.status != VELTRA_OK) {
     return failed(description.status,
-                  description.status == VELTRA_TOO_LARGE
-                      ? "The user info is too large: with the session info it must fit into 1,048,576 bytes."
-                      : "The user info is no dictionary.",
+                  "The user info is too large: with the session info it must fit into 1,048,576 bytes.",
                   status, error);
   }
   const std::string root =
@@ -111,7 +111,14 @@ veltra_session* veltra_session_create(const veltra_session_options* options, vel
       std::move(reached).value(), options->queue_bytes ? options->queue_bytes : kDefaultQueueBytes,
       aggregationHandler(options->aggregated, options->aggregated_context), text);
   if (!connection) return failed(VELTRA_NO_DAEMON, text, status, error);
-  return new veltra_session{std::move(connection)};
+  return new veltra_session{std::move(connection), options->aggregated != nullptr};
+}
+
+veltra_status veltra_session_describe(veltra_session* session, const veltra_session_options* given) {
+  const auto options = client::completeOptions(given);
+  if (!session || !options || client::problemOfDescription(*options)) return VELTRA_INVALID;
+  if (options->aggregated && !session->mayAggregate) return VELTRA_INVALID;
+  return send(session, client::sessionInfoFrame(*options), nullptr, nullptr);
 }
 
 void veltra_free(char* text) {
