@@ -33,6 +33,7 @@ typedef enum veltra_status {
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
   VELTRA_TOO_LARGE = 7,      /* over 1 MiB (log data 16 MiB), 100,000 keys and values, 60 levels; not sent */
+  VELTRA_FORKED = 8,         /* the session belongs to the process that this one was forked from */
 } veltra_status;
 
 /* A short English text for a status, valid for ever. */
@@ -304,6 +305,13 @@ typedef struct veltra_statistics {
   uint64_t dropped_events; /* aggregated copies lost because more than 4,096 waited for the callback */
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
+
+typedef enum veltra_counter {
+  VELTRA_COUNTER_LOST,        /* messages, files and log data that were accepted and then lost */
+  VELTRA_COUNTER_CONNECTIONS, /* connections to the daemon that the session has had */
+} veltra_counter;
+/* 0 for an unknown counter. */
+VELTRA_API uint64_t veltra_session_counter(veltra_session*, veltra_counter);
 
 /* Writes the waiting calls for at most 2 s, closes the connection, ends open calls with VELTRA_NO_REPLY
  * (their callbacks run before this returns) and frees the session. Returns the number of calls that were not

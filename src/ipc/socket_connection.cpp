@@ -257,8 +257,9 @@ void SocketConnection::end() {
   _interruptionHandler = nullptr;
   _observer.reset();
   if (const auto session = std::exchange(_session, nullptr)) {
-    session->end();
+    // Before the session's end, so that the client knows what the end of its copies means.
     if (_greeted && _stopping.load(std::memory_order_acquire)) sendGoodbye(*_out, _calls);
+    session->end();
   }
   writeRest();
   _out->close();
