@@ -21,7 +21,7 @@ from harness import ENTITLEMENT, Daemon, Lab, Root, Wire, closed_port, program, 
 
 # Client types, by what becomes of their messages.
 OVERLOAD, BATCHES_OF_50, UPLOADS, BATCHES_OF_1000, SINGLE, DATAGRAMS, COPIED, REFUSED, CAPTURED = 5, 6, 7, 8, 9, 10, 12, 16, 17
-POSTS_UNDER_OVERLOAD = 100  # a second, which is all that the collector answers then
+POSTS_UNDER_OVERLOAD = 20  # a second, which is all that the collector answers then
 NGINX = """daemon off; master_process off; pid {dir}/nginx.pid; error_log {dir}/nginx.log;
 events {{ worker_connections 4096; }}
 http {{ access_log off; client_max_body_size 0; keepalive_requests 100000000; keepalive_timeout 1h;
