@@ -33,6 +33,7 @@ typedef enum veltra_status {
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
   VELTRA_TOO_LARGE = 7,      /* over 1 MiB (log data 16 MiB), 100,000 keys and values, 60 levels; not sent */
+  VELTRA_FORKED = 8,         /* the session belongs to the process that this one was forked from */
 } veltra_status;
 
 /* A short English text for a status, valid for ever. */
@@ -132,13 +133,64 @@ typedef struct veltra_session veltra_session;
 typedef void (*veltra_aggregation_callback)(void* context, const veltra_value* session_info, double timestamp,
                                             uint16_t category, uint16_t type, const veltra_value* payload);
 
-/* Its 17 fields are what the daemon is told about the session, and how the library serves it. */
+/* The state of a session's connection. */
+typedef enum veltra_connection_state {
+  VELTRA_STATE_CONNECTING,
+  VELTRA_STATE_CONNECTED,
+  VELTRA_STATE_STARTED,
+  VELTRA_STATE_LOST,
+  VELTRA_STATE_CLOSED,
+} veltra_connection_state;
+
+/* Learns of each change. `backends`: those that report, an array of texts, or NULL; only with
+ * VELTRA_STATE_STARTED. `why`: a text, or NULL. Both are valid until it returns. */
+typedef void (*veltra_state_callback)(void* context, veltra_connection_state, const veltra_value* backends,
+                                      const char* why);
+
+/* The kinds of clients. Each is named after the code that identifies it in reports. */
+typedef enum veltra_client_type {
+  VELTRA_CLIENT_TYPE_PV = 0,
+  VELTRA_CLIENT_TYPE_DR = 1,
+  VELTRA_CLIENT_TYPE_XLN = 2,
+  VELTRA_CLIENT_TYPE_BQ = 3,
+  VELTRA_CLIENT_TYPE_HW = 4,
+  VELTRA_CLIENT_TYPE_ZE = 5,
+  VELTRA_CLIENT_TYPE_FU = 6,
+  VELTRA_CLIENT_TYPE_JY = 7,
+  VELTRA_CLIENT_TYPE_KO = 8,
+  VELTRA_CLIENT_TYPE_WA = 9,
+  VELTRA_CLIENT_TYPE_UT = 10,
+  VELTRA_CLIENT_TYPE_EB = 11,
+  VELTRA_CLIENT_TYPE_MYRT = 12,
+  VELTRA_CLIENT_TYPE_QOLIN = 13,
+  VELTRA_CLIENT_TYPE_FU_GLP = 14,
+  VELTRA_CLIENT_TYPE_FU_TOLMS = 15,
+  VELTRA_CLIENT_TYPE_GARNOVE = 16,
+  VELTRA_CLIENT_TYPE_LIMBET = 17,
+} veltra_client_type;
+
+/* How a message is treated; REALTIME | OVERRIDE_SAMPLING is both. */
+typedef enum veltra_flag {
+  VELTRA_FLAG_NONE = 0,
+  VELTRA_FLAG_REALTIME = 1,          /* posted at once, and what is batched before it */
+  VELTRA_FLAG_OVERRIDE_SAMPLING = 2, /* a back end that sampling holds back reports from now on */
+} veltra_flag;
+
+/* The types of messages of category 0, which are about the session itself. Daemon and library send them. */
+typedef enum veltra_message_kind {
+  VELTRA_MESSAGE_START = 0,
+  VELTRA_MESSAGE_STOP = 1,
+  VELTRA_MESSAGE_FINISH = 2,
+} veltra_message_kind;
+
+/* Its 22 fields are what the daemon is told about the session, and how the library serves it. A program that
+ * was built with an earlier version of the struct goes on. */
 typedef struct veltra_session_options {
   size_t size;      /* sizeof(veltra_session_options), which identifies the version of the struct */
   const char* root; /* the directory that contains run/veltrad; NULL: VELTRA_ROOT, else "/" */
   /* Session info. A key is left out if its has_… is false. */
   bool has_client_type;
-  int32_t client_type; /* 0 to 17 */
+  int32_t client_type; /* 0 to 17: a veltra_client_type */
   bool has_session_id;
   uint32_t session_id;
   bool has_client_version;
@@ -157,6 +209,14 @@ typedef struct veltra_session_options {
   size_t queue_bytes;
   /* Does not describe the session on connecting: for one-shot messages, which contain a description. */
   bool undescribed;
+  /* Does not wait for a daemon, and does not fail without one. */
+  bool connect_later;
+  uint32_t connect_timeout_ms; /* 0: 5,000 */
+  /* If not NULL, learns of each change of the connection's state, on a thread of the session. */
+  veltra_state_callback state_changed;
+  void* state_context;
+  /* An array of names that the daemon is told with the description, or NULL. */
+  const veltra_value* frameworks_to_check;
 } veltra_session_options;
 
 /* Fills in the defaults and `size`. */
@@ -169,6 +229,11 @@ VELTRA_API veltra_session* veltra_session_create(const veltra_session_options* o
                                                  char** error);
 VELTRA_API void veltra_free(char* text);
 
+/* Describes a live session anew: session info, user info and frameworks replace the former ones, and the back
+ * ends follow at the next start. If `aggregated` is NULL, the session ends its aggregation; one that was made
+ * without it cannot begin any. The other options stay as the session was made with. Does not wait. */
+VELTRA_API veltra_status veltra_session_describe(veltra_session*, const veltra_session_options* options);
+
 /* Without _wait: VELTRA_OK means that the call was accepted and `callback` (unless NULL) will run exactly
  * once; otherwise nothing was sent and the callback will not run. With _wait: waits for the answer and
  * returns its status;
@@ -176,7 +241,7 @@ VELTRA_API void veltra_free(char* text);
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
 
-/* `payload` is a dictionary or NULL. flag: 1 and 3 are realtime, 2 and 3 override sampling, 0 is neither. */
+/* `payload` is a dictionary or NULL. flag: 0 to 3, see veltra_flag. */
 VELTRA_API veltra_status veltra_session_send(veltra_session*, uint16_t category, uint16_t type,
                                              const veltra_value* payload, uint32_t flag, veltra_callback,
                                              void* context);
@@ -240,6 +305,13 @@ typedef struct veltra_statistics {
   uint64_t dropped_events; /* aggregated copies lost because more than 4,096 waited for the callback */
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
+
+typedef enum veltra_counter {
+  VELTRA_COUNTER_LOST,        /* messages, files and log data that were accepted and then lost */
+  VELTRA_COUNTER_CONNECTIONS, /* connections to the daemon that the session has had */
+} veltra_counter;
+/* 0 for an unknown counter. */
+VELTRA_API uint64_t veltra_session_counter(veltra_session*, veltra_counter);
 
 /* Writes the waiting calls for at most 2 s, closes the connection, ends open calls with VELTRA_NO_REPLY
  * (their callbacks run before this returns) and frees the session. Returns the number of calls that were not

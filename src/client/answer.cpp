@@ -114,8 +114,9 @@ const char* veltra_status_text(veltra_status status) {
                                            "An argument is not what it must be; nothing was done.",
                                            "The call ended without an answer.",
                                            "A waiting call inside a callback would wait for itself.",
-                                           "The call is larger than a frame may be; nothing was sent."};
-  static_assert(std::size(kTexts) == VELTRA_TOO_LARGE + 1);
+                                           "The call is larger than a frame may be; nothing was sent.",
+                                           "The session belongs to the process that forked this one."};
+  static_assert(std::size(kTexts) == VELTRA_FORKED + 1);
   const auto place = static_cast<std::size_t>(status);
   return place < std::size(kTexts) ? kTexts[place] : "Unknown status.";
 }

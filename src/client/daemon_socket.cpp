@@ -2,6 +2,7 @@
 // Connects to the daemon and exchanges hellos. Every failure has a text that says what to do.
 #include "client/daemon_socket.h"
 
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -25,6 +26,10 @@ namespace {
 
 std::string errorText(int number) {
   return std::error_code(number, std::generic_category()).message();
+}
+
+double seconds(std::chrono::milliseconds time) {
+  return std::chrono::duration<double>(time).count();
 }
 
 ConnectFailure noDaemon(std::string text) {
@@ -54,7 +59,7 @@ ConnectFailure refusedConnection(const std::string& shown, const std::string& pa
   return noDaemon(fmt::format("The daemon that made {} has ended: start veltrad again.", shown));
 }
 
-ConnectFailure connectFailure(int error, const std::string& path) {
+ConnectFailure connectFailure(int error, const std::string& path, std::chrono::milliseconds patience) {
   const std::string shown = escapedForLog(path);
   switch (error) {
     case ENOENT:
@@ -74,13 +79,13 @@ ConnectFailure connectFailure(int error, const std::string& path) {
       return noDaemon(
           fmt::format("The daemon on {} accepted no connection within {} s: see whether it is stuck or "
                       "overloaded.",
-                      shown, kGreetingTimeout.count()));
+                      shown, seconds(patience)));
     default:
       return noDaemon(fmt::format("Connecting to {} failed: {}.", shown, errorText(error)));
   }
 }
 
-Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
+Result<sockaddr_un, ConnectFailure> addressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   if (path.size() >= sizeof address.sun_path) {
@@ -92,16 +97,25 @@ Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path) {
             escapedForLog(path), path.size(), sizeof address.sun_path - 1)}};
   }
   std::memcpy(address.sun_path, path.data(), path.size());
-  FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  return address;
+}
+
+// `patience` limits the wait for a place in the listener's backlog, and the sending of the first frames; none
+// means not to wait.
+Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path,
+                                                 std::chrono::milliseconds patience) {
+  const auto address = addressOf(path);
+  if (!address) return Failure{address.error()};
+  const int waits = patience.count() == 0 ? SOCK_NONBLOCK : 0;
+  FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | waits, 0));
   if (!made.isOpen()) return Failure{noDaemon(fmt::format("No socket could be made: {}.", errorText(errno)))};
-  // Limits the wait for a place in the listener's backlog, and the sending of the first frames.
-  const timeval bound{kGreetingTimeout.count(), 0};
+  const timeval bound{patience.count() / 1000, patience.count() % 1000 * 1000};
   ::setsockopt(made.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
   int failed;
   do {
-    failed = ::connect(made.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    failed = ::connect(made.get(), reinterpret_cast<const sockaddr*>(&address.value()), sizeof(sockaddr_un));
   } while (failed != 0 && errno == EINTR);
-  if (failed != 0) return Failure{connectFailure(errno, path)};
+  if (failed != 0) return Failure{connectFailure(errno, path, patience)};
   return made;
 }
 
@@ -115,7 +129,8 @@ bool sendAll(int socket, std::string_view bytes) {
   return true;
 }
 
-// Absent if the daemon's hello is valid.
+}  // namespace
+
 std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const std::string& shown) {
   const auto parsed = parseBinaryPropertyList(frame.body);
   const Dictionary* body = parsed ? parsed.value().asDictionary() : nullptr;
@@ -139,7 +154,29 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
   return std::nullopt;
 }
 
-}  // namespace
+ConnectFailure unansweredGreeting(const std::string& path, std::chrono::milliseconds patience) {
+  return noDaemon(
+      fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or overloaded.",
+                  escapedForLog(path), seconds(patience)));
+}
+
+std::optional<ConnectFailure> verdictOnPath(const std::string& path) {
+  const auto address = addressOf(path);
+  return address ? std::nullopt : std::optional(address.error());
+}
+
+std::string helloFrame() {
+  return wire::makeFrame(
+      wire::FrameKind::hello, 0,
+      Dictionary{{key::kWire, Value(wire::kWireVersion)}, {key::kLibrary, veltra_version()}});
+}
+
+Result<FileDescriptor, ConnectFailure> connectAtOnce(const std::string& path) {
+  auto connected = connectTo(path, std::chrono::milliseconds(0));
+  // From here on each call says itself whether it may wait.
+  if (connected) ::fcntl(connected.value().get(), F_SETFL, 0);
+  return connected;
+}
 
 Received receiveFrame(DaemonSocket& daemon, std::chrono::steady_clock::time_point deadline,
                       wire::Frame& frame) {
@@ -167,24 +204,18 @@ Received receiveFrame(DaemonSocket& daemon, std::chrono::steady_clock::time_poin
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience) {
   const auto deadline = std::chrono::steady_clock::now() + patience;
-  auto connected = connectTo(path);
+  auto connected = connectTo(path, patience);
   if (!connected) return Failure{connected.error()};
   DaemonSocket daemon{std::move(connected).value(), {}};
-  const std::string hello =
-      wire::makeFrame(wire::FrameKind::hello, 0,
-                      Dictionary{{key::kWire, Value(wire::kWireVersion)}, {key::kLibrary, veltra_version()}});
   // A daemon that refuses may end the connection before all is sent; its refusal can still be read.
-  (void)sendAll(daemon.socket.get(), hello + firstCalls);
+  (void)sendAll(daemon.socket.get(), helloFrame() + firstCalls);
   const std::string shown = escapedForLog(path);
   wire::Frame frame;
   switch (receiveFrame(daemon, deadline, frame)) {
     case Received::frame:
       break;
     case Received::timeout:
-      return Failure{
-          noDaemon(fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or "
-                               "overloaded.",
-                               shown, std::chrono::duration<double>(patience).count()))};
+      return Failure{unansweredGreeting(path, patience)};
     case Received::end:
       return Failure{
           noDaemon(fmt::format("The daemon on {} ended the connection without a word: start veltrad "

@@ -44,6 +44,7 @@ inline constexpr const char* kNames[] = {
 
 // What the daemon calls.
 namespace event {
+inline constexpr const char* kGoodbye = "goodbye";
 inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";
 inline constexpr const char* kSendMessageToClient = "sendMessageToClient:timestamp:category:type:payload:";
 }  // namespace event
@@ -64,6 +65,7 @@ inline constexpr const char* kResults = "results";
 
 // Arguments.
 inline constexpr const char* kCall = "call";
+inline constexpr const char* kCalls = "calls";
 inline constexpr const char* kCategory = "category";
 inline constexpr const char* kData = "data";
 inline constexpr const char* kFrameworksToCheck = "frameworksToCheck";
