@@ -10,8 +10,7 @@ Daemon::Daemon(Services& services)
       _device(services.device),
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
       _choices(services.files, services.root.settingsPath()),
-      _secret(services.files, services.root.secretPath()),
-      _sampling(_choices, _secret),
+      _sampling(_choices, services.secret),
       _messageLog(services.clock, services.root.messageLogDirectory(), services.writer, services.counters),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _device, _library,
@@ -27,6 +26,7 @@ void Daemon::readConfigurationAgain() {
   _services.device.readAgain();
   _settings.readDeploymentAgain();
   _choices.readAgain();
+  _services.policy.readAgain();
 }
 
 }  // namespace veltrad::daemon

@@ -10,7 +10,6 @@
 #include "config/storebag_store.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
-#include "platform/device_secret.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
@@ -19,7 +18,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 13 fields are these objects, in the order in which they need each other.
+// 12 fields are these objects, in the order in which they need each other.
 class Daemon {
  public:
   explicit Daemon(Services& services);
@@ -36,7 +35,6 @@ class Daemon {
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
   config::OperatorSettings _choices;
-  platform::DeviceSecret _secret;
   backends::SamplingFactors _sampling;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;

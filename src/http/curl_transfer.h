@@ -29,6 +29,7 @@ class CurlTransfer {
   HTTPRequest::Lane lane() const { return _request.lane; }
   // "name:port" as in the URL: connections are counted by it.
   const std::string& host() const { return _host; }
+  std::string hostName() const { return http::hostName(_request.url); }
   std::uintptr_t sequence() const { return _request.sequence; }
   Time arrived() const { return _arrived; }
   // True if a thread waits in perform().

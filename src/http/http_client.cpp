@@ -48,7 +48,8 @@ struct CurlHTTPClient::Impl {
   using Easy = std::unique_ptr<CURL, decltype(&curl_easy_cleanup)>;
   static constexpr std::size_t kIdleHandles = 8;
 
-  explicit Impl(HTTPClientSettings settings) : connections(std::move(settings.extraCertificatesPath)) {
+  explicit Impl(HTTPClientSettings settings)
+      : connections(std::move(settings.extraCertificatesPath)), gate(settings.gate) {
     idleHandles.reserve(kIdleHandles);
   }
 
@@ -63,6 +64,8 @@ struct CurlHTTPClient::Impl {
 
   void run();
   void stop(const HTTPQueue::Predicate& matches);
+  std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
+  void endRefused(bool alsoRunning);
   void startNext();
   void startOne(Transfers one);
   bool begins(CURL* easy, CurlTransfer& transfer);
@@ -79,6 +82,7 @@ struct CurlHTTPClient::Impl {
   // Once it is true, `multi` and `thread` do not change.
   std::atomic<bool> started{false};
   Connections connections;
+  const RequestGate* const gate;
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
   ServerRecords records;
@@ -142,6 +146,7 @@ void CurlHTTPClient::Impl::run() {
       stop([](const CurlTransfer&) { return true; });
     else if (orders.failBlocking)
       stop([](const CurlTransfer& transfer) { return transfer.blocking(); });
+    if (orders.askWaiting) endRefused(orders.askRunning);
     int left = 0;
     curl_multi_perform(multi.get(), &left);
     finish();
@@ -162,6 +167,31 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
   }
 }
 
+std::optional<HTTPError> CurlHTTPClient::Impl::refusalOf(const CurlTransfer& transfer) const {
+  if (gate == nullptr) return std::nullopt;
+  auto refused = gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName());
+  if (!refused) return std::nullopt;
+  HTTPError error{HTTPError::Kind::refused, std::move(refused->text)};
+  error.refusal = refused->reason;
+  return error;
+}
+
+void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
+  Transfers taken =
+      queue.take([this](const CurlTransfer& waiting) { return refusalOf(waiting).has_value(); });
+  while (!taken.empty()) {
+    Transfers one = HTTPQueue::pop(taken, taken.begin());
+    auto refused = refusalOf(one.front());
+    // What was refused once is not put back if the gate has opened since.
+    complete(std::move(one),
+             Failure{refused.value_or(HTTPError{HTTPError::Kind::refused, "Refused before"})});
+  }
+  for (auto next = running.begin(); alsoRunning && next != running.end();) {
+    const auto at = next++;
+    if (auto refused = refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
+  }
+}
+
 void CurlHTTPClient::Impl::startNext() {
   try {
     const auto now = std::chrono::steady_clock::now();
@@ -172,6 +202,7 @@ void CurlHTTPClient::Impl::startNext() {
 }
 
 void CurlHTTPClient::Impl::startOne(Transfers one) {
+  if (auto refused = refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
   Easy easy(nullptr, curl_easy_cleanup);
   if (idleHandles.empty()) {
     easy.reset(curl_easy_init());
@@ -250,7 +281,8 @@ void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
 // What this end could not begin, or gave up, says nothing of the server.
 void CurlHTTPClient::Impl::record(const std::string& host, const HTTPResult& result) {
   const bool own = !result && (result.error().kind == HTTPError::Kind::shortage ||
-                               result.error().kind == HTTPError::Kind::stopping);
+                               result.error().kind == HTTPError::Kind::stopping ||
+                               result.error().kind == HTTPError::Kind::refused);
   if (own) return;
   const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
   records.ended(host, result && result.value().status < 400, now.count());
@@ -286,6 +318,11 @@ HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
 
 bool CurlHTTPClient::stopping() const {
   return _impl->queue.blockingFails();
+}
+
+void CurlHTTPClient::endRefused(bool running) {
+  _impl->queue.endRefused(running);
+  _impl->wake();
 }
 
 void CurlHTTPClient::failBlockingWaits() {

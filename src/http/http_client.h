@@ -14,6 +14,7 @@
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
+#include "http/request_gate.h"
 #include "http/server_records.h"
 #include "platform/memory_budget.h"
 
@@ -74,8 +75,9 @@ struct HTTPResponse {
 struct HTTPError {
   // transport: refused, not resolved, not trusted, cut, timed out, not https, or headers beyond their limit.
   // tooLarge: the answer is beyond its limit. tooMany: the lane is full. shortage: no descriptor, thread or
-  // memory. With tooMany and shortage nothing was sent.
-  enum class Kind { transport, tooLarge, tooMany, shortage, stopping };
+  // memory. refused: the owner of the device does not let it leave. With tooMany and shortage nothing was
+  // sent.
+  enum class Kind { transport, tooLarge, tooMany, shortage, stopping, refused };
   Kind kind = Kind::transport;
   // One line: "Could not resolve host: x".
   std::string description;
@@ -84,6 +86,8 @@ struct HTTPError {
   // Where a transport error ended the exchange.
   enum class Cause { other, resolve, connect, trust, timeout };
   Cause cause = Cause::other;
+  // Of one that was refused.
+  std::optional<wire::Reason> refusal = std::nullopt;
 };
 
 // What the request keeps until its completion has run, including libcurl's copies, without the completion
@@ -108,7 +112,13 @@ class HTTPClient {
 struct HTTPClientSettings {
   // Certificates in PEM form that are trusted besides the system's. The file may be missing.
   std::string extraCertificatesPath;
+  // Asked on the HTTP thread before each request begins; outlives the client. Null: every request may.
+  const RequestGate* gate = nullptr;
 };
+
+// The host that a request to this URL would contact, without port; empty if it names none. By libcurl's own
+// parser, so that nobody's idea of an address differs from where the request goes.
+std::string hostName(const std::string& url);
 
 // "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
 std::string transportLibraries();
@@ -124,6 +134,9 @@ class CurlHTTPClient final : public HTTPClient {
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 
+  // Asks the gate again for the requests that wait and, if `running`, for those that have begun; ends those
+  // that it refuses.
+  void endRefused(bool running);
   // From now on perform() fails at once; this ends calls that wait, too.
   void failBlockingWaits();
   // Waits at most until `deadline` for all transfers to end, then ends the others with `stopping`.

@@ -41,6 +41,7 @@ class Root {
   std::string devicePath() const { return path("etc/veltrad/device.plist"); }
   std::string deploymentPath() const { return path("etc/veltrad/deployment.plist"); }
   std::string settingsPath() const { return path("etc/veltrad/settings.json"); }
+  std::string policyPath() const { return path("etc/veltrad/policy.json"); }
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }

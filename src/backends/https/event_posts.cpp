@@ -25,6 +25,8 @@ wire::Reason reasonOf(http::HTTPError::Kind kind) {
       return wire::Reason::post_shortage;
     case http::HTTPError::Kind::stopping:
       return wire::Reason::post_stopped;
+    case http::HTTPError::Kind::refused:
+      return wire::Reason::refused_by_owner;
   }
   return wire::Reason::post_failed;
 }

@@ -37,6 +37,8 @@ wire::Reason fateAfter(http::HTTPError::Kind kind) {
       return wire::Reason::file_shortage;
     case http::HTTPError::Kind::stopping:
       return wire::Reason::file_stopped;
+    case http::HTTPError::Kind::refused:
+      return wire::Reason::file_refused_by_owner;
   }
   return wire::Reason::file_exchange_failed;
 }

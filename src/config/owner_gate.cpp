@@ -1,0 +1,69 @@
+// SPDX-License-Identifier: Apache-2.0
+// Puts the owner's word together. Any thread.
+#include "config/owner_gate.h"
+
+#include <string>
+#include <utility>
+
+#include "config/preference_keys.h"
+#include "platform/device_secret.h"
+#include "platform/preferences.h"
+
+namespace veltrad::config {
+
+namespace {
+// Nothing: it cannot be read just now.
+std::optional<bool> isTrue(platform::Preferences& preferences, const char* key) {
+  const auto found = preferences.lookUp(platform::kVeltraPreferenceDomain, key);
+  if (!found) return std::nullopt;
+  return found.value() && found.value()->toBoolean().value_or(false);
+}
+
+std::string textOf(wire::Reason reason) {
+  return std::string("The owner of the device does not let it leave (") +
+         std::string(wire::entryOf(reason).name) + ")";
+}
+}  // namespace
+
+OwnerGate::OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret)
+    : _policy(policy), _preferences(preferences), _secret(secret) {}
+
+bool OwnerGate::refresh() {
+  auto policy = _policy.current();
+  const PolicyRules& rules = policy->rules();
+  const auto off = isTrue(_preferences, preference::kReportingOff);
+  const auto consent =
+      rules.consent == ConsentRule::always ? isTrue(_preferences, preference::kConsent) : true;
+  if (!off || !consent) return false;
+  const auto refusal = *off ? wire::Reason::privacy_off : policy->refusal(*consent);
+  const auto before = word();
+  auto fields = before->fields;
+  if (policy != before->policy) {
+    const bool has = !rules.remove.texts.empty() || !rules.hash.texts.empty();
+    const auto secret = has ? _secret.bytes() : std::string();
+    if (!secret) return false;
+    fields = has ? std::make_shared<const FieldRules>(rules, *secret) : nullptr;
+  } else if (refusal == before->refusal) {
+    return false;
+  }
+  auto word = std::make_shared<const OwnersWord>(OwnersWord{std::move(policy), refusal, std::move(fields)});
+  const Lock held(_mutex);
+  _word = std::move(word);
+  _turn.fetch_add(1, std::memory_order_release);
+  return true;
+}
+
+std::shared_ptr<const OwnersWord> OwnerGate::word() const {
+  const Lock held(_mutex);
+  return _word;
+}
+
+std::optional<http::RequestRefusal> OwnerGate::refusal(bool forStorebag, std::string_view host) const {
+  const auto now = word();
+  auto reason = forStorebag ? std::nullopt : now->refusal;
+  if (!reason && !now->policy->reaches(host)) reason = wire::Reason::policy_hosts;
+  if (!reason) return std::nullopt;
+  return http::RequestRefusal{*reason, textOf(*reason)};
+}
+
+}  // namespace veltrad::config

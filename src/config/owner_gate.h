@@ -1,0 +1,57 @@
+// SPDX-License-Identifier: Apache-2.0
+// The owner's word on what may leave the device: policy, consent and "reporting off" together. Any thread.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string_view>
+
+#include "base/mutex.h"
+#include "config/field_rules.h"
+#include "config/owner_policy.h"
+#include "http/request_gate.h"
+#include "wire/reasons.h"
+
+namespace veltrad::platform {
+class DeviceSecret;
+class Preferences;
+}  // namespace veltrad::platform
+
+namespace veltrad::config {
+
+// Immutable.
+struct OwnersWord {
+  std::shared_ptr<const Policy> policy = Policy::closed();
+  // Why no back end reports; nothing: each may.
+  std::optional<wire::Reason> refusal = wire::Reason::policy_broken;
+  // Null: messages stay as they are.
+  std::shared_ptr<const FieldRules> fields;
+};
+
+// What cannot be read for a shortage is no change.
+class OwnerGate final : public http::RequestGate {
+ public:
+  // The arguments outlive it. Nothing may leave before the first refresh().
+  OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret);
+
+  // Reads again what has changed. True if the word is another one.
+  bool refresh();
+  // The word of the last refresh, never null.
+  std::shared_ptr<const OwnersWord> word() const;
+  // Grows with each change of the word, so that its readers see cheaply that there is one.
+  std::uint64_t turn() const { return _turn.load(std::memory_order_acquire); }
+  // A request for a storebag is asked for its host alone.
+  std::optional<http::RequestRefusal> refusal(bool forStorebag, std::string_view host) const override;
+
+ private:
+  OwnerPolicy& _policy;
+  platform::Preferences& _preferences;
+  platform::DeviceSecret& _secret;
+  std::atomic<std::uint64_t> _turn{0};
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  std::shared_ptr<const OwnersWord> _word GUARDED_BY(_mutex) = std::make_shared<const OwnersWord>();
+};
+
+}  // namespace veltrad::config
