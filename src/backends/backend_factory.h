@@ -2,6 +2,7 @@
 // Makes back ends by name. Any thread.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -65,6 +66,10 @@ class BackendFactory {
   void sayRest() { _posts.sayRest(); }
   // Frees memory that is kept for the next message. Called when nothing was sent for a while.
   void rest() { _posts.rest(); }
+  // Drops what waits for dashboards after its session. `refuses`: whether a host may not be reached.
+  void dropWaiting(const std::function<bool(const std::string& host)>& refuses) {
+    _dashboards->dropWaiting(refuses);
+  }
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,

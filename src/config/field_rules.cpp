@@ -68,6 +68,10 @@ void FieldRules::apply(Dictionary& message, EditedFields& changes) const {
   if (auto changed = edited(message, changes)) message = std::move(*changed);
 }
 
+void FieldRules::apply(Value& value, EditedFields& changes) const {
+  if (auto changed = edited(value, changes)) value = std::move(*changed);
+}
+
 std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, EditedFields& changes) const {
   std::vector<Dictionary::Entry> entries;
   bool changed = false;

@@ -31,6 +31,7 @@ class FieldRules {
   bool removes(std::string_view name) const;
   // Changes the message in place; one without such fields stays the same shared object.
   void apply(Dictionary& message, EditedFields& changes) const;
+  void apply(Value& value, EditedFields& changes) const;
   // The value that stands for one that is to be hashed: the HMAC-SHA-256 of a text, or of the JSON text of
   // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed.
   std::optional<std::string> digest(const Value& value) const;

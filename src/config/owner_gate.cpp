@@ -2,6 +2,7 @@
 // Puts the owner's word together. Any thread.
 #include "config/owner_gate.h"
 
+#include <algorithm>
 #include <string>
 #include <utility>
 
@@ -24,6 +25,16 @@ std::string textOf(wire::Reason reason) {
          std::string(wire::entryOf(reason).name) + ")";
 }
 }  // namespace
+
+std::optional<wire::Reason> OwnersWord::refusalFor(std::string_view backend,
+                                                   const std::vector<std::string>& hosts) const {
+  if (refusal) return refusal;
+  if (!policy->makes(backend)) return wire::Reason::policy_backends;
+  const bool reaches = hosts.empty() || std::any_of(hosts.begin(), hosts.end(), [this](const auto& host) {
+                         return policy->reaches(host);
+                       });
+  return reaches ? std::nullopt : std::optional(wire::Reason::policy_hosts);
+}
 
 OwnerGate::OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret)
     : _policy(policy), _preferences(preferences), _secret(secret) {}

@@ -6,7 +6,9 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/mutex.h"
 #include "config/field_rules.h"
@@ -28,6 +30,11 @@ struct OwnersWord {
   std::optional<wire::Reason> refusal = wire::Reason::policy_broken;
   // Null: messages stay as they are.
   std::shared_ptr<const FieldRules> fields;
+
+  // Why a back end may not report; nothing: it may. `hosts`: those that it may send to; one that the policy
+  // lists suffices, because each request is asked for again.
+  std::optional<wire::Reason> refusalFor(std::string_view backend,
+                                         const std::vector<std::string>& hosts) const;
 };
 
 // What cannot be read for a shortage is no change.

@@ -18,12 +18,15 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 12 fields are these objects, in the order in which they need each other.
+// 13 fields are these objects, in the order in which they need each other, and what the owner said last.
 class Daemon {
  public:
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
+  // Reads the owner's word again and, if it has changed, stops what may not leave any more. Called several
+  // times a second.
+  void hearOwner();
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
@@ -42,6 +45,8 @@ class Daemon {
   config::StorebagStore _storebagStore;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
+  // The word has changed, and requests that had begun have been given until the next call.
+  bool _graceRuns = false;
 };
 
 }  // namespace veltrad::daemon

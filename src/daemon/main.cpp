@@ -32,6 +32,9 @@ using namespace std::chrono_literals;
 constexpr auto kStopBound = 10s;
 // How often the counters are written and the watchdog is fed.
 constexpr auto kTick = 1000ms;
+// How often the owner's word is read again in that time: a change and the end of what is under way, which
+// takes one more time, are done within a second.
+constexpr int kOwnerTicks = 3;
 // Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
 // may have.
 constexpr std::size_t kMostObservers = 64;
@@ -135,7 +138,11 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
+  int ownerTicks = 0;
   const auto onTick = [&] {
+    daemon.hearOwner();
+    if (++ownerTicks < kOwnerTicks) return;
+    ownerTicks = 0;
     countersFile.writeSoon();
     metricsFile.writeSoon();
     // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
@@ -153,7 +160,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
   };
-  loop.run(tick, onTick, [&] {
+  loop.run(tick / kOwnerTicks, onTick, [&] {
     logInfo("main: SIGHUP, configuration is read again");
     daemon.readConfigurationAgain();
   });
@@ -220,6 +227,7 @@ int main(int count, char** arguments) {
   services.writer.start();
   platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
                                    services.root.countersPath());
+  services.gate.refresh();
   daemon::Daemon daemon(services);
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
                           services.counters, services.memory, services.root.entitlementsPath()},

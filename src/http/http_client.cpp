@@ -9,6 +9,7 @@
 #include <atomic>
 #include <chrono>
 #include <future>
+#include <map>
 #include <new>
 #include <system_error>
 #include <thread>
@@ -66,6 +67,7 @@ struct CurlHTTPClient::Impl {
   void stop(const HTTPQueue::Predicate& matches);
   std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
   void endRefused(bool alsoRunning);
+  Transfers takeRefused();
   void startNext();
   void startOne(Transfers one);
   bool begins(CURL* easy, CurlTransfer& transfer);
@@ -176,20 +178,40 @@ std::optional<HTTPError> CurlHTTPClient::Impl::refusalOf(const CurlTransfer& tra
   return error;
 }
 
+// One that is missed for lack of memory is refused when it would begin.
 void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
-  Transfers taken =
-      queue.take([this](const CurlTransfer& waiting) { return refusalOf(waiting).has_value(); });
-  while (!taken.empty()) {
-    Transfers one = HTTPQueue::pop(taken, taken.begin());
-    auto refused = refusalOf(one.front());
-    // What was refused once is not put back if the gate has opened since.
-    complete(std::move(one),
-             Failure{refused.value_or(HTTPError{HTTPError::Kind::refused, "Refused before"})});
+  try {
+    for (Transfers taken = takeRefused(); !taken.empty();) {
+      Transfers one = HTTPQueue::pop(taken, taken.begin());
+      // What was refused a moment ago is not put back if the gate has opened since.
+      const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
+      HTTPError refused = refusalOf(one.front()).value_or(before);
+      complete(std::move(one), Failure{std::move(refused)});
+    }
+    for (auto next = running.begin(); alsoRunning && next != running.end();) {
+      const auto at = next++;
+      if (auto refused = refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
+    }
+  } catch (const std::bad_alloc&) {
   }
-  for (auto next = running.begin(); alsoRunning && next != running.end();) {
-    const auto at = next++;
-    if (auto refused = refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
-  }
+}
+
+// The gate is not asked under the queue's lock, so the hosts are collected first.
+CurlHTTPClient::Impl::Transfers CurlHTTPClient::Impl::takeRefused() {
+  using Key = std::pair<bool, std::string>;
+  const auto keyOf = [](const CurlTransfer& transfer) {
+    return Key(transfer.lane() == HTTPRequest::Lane::storebag, transfer.host());
+  };
+  std::map<Key, bool> refused;
+  queue.take([&](const CurlTransfer& transfer) {
+    refused.try_emplace(keyOf(transfer), false);
+    return false;
+  });
+  for (auto& [key, is] : refused) is = gate && gate->refusal(key.first, hostName("https://" + key.second));
+  return queue.take([&](const CurlTransfer& transfer) {
+    const auto found = refused.find(keyOf(transfer));
+    return found != refused.end() && found->second;
+  });
 }
 
 void CurlHTTPClient::Impl::startNext() {

@@ -11,6 +11,7 @@
 
 #include "backends/backend.h"
 #include "base/value.h"
+#include "config/owner_gate.h"
 #include "ipc/connection.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
@@ -39,6 +40,7 @@ struct SessionServices {
   platform::Counters& counters;
   FlushCounters& flushes;
   support::MessageLog& messageLog;
+  const config::OwnerGate& gate;
 };
 
 // The agent's list and the connection own it. The delegate outlives it.
@@ -79,6 +81,10 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
+  // Takes the owner's word over if it has changed, also into the back ends.
+  void hearOwner();
+  // The same without what the owner keeps back; null stays null.
+  backends::SharedDictionary allowed(const backends::SharedDictionary& userInfo) const;
   void createBackendsWithStorebag(const config::StorebagSection& storebag);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
@@ -116,6 +122,10 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
   backends::SharedDictionary _userInfo;
+  // What of it may leave the device.
+  backends::SharedDictionary _sentUserInfo;
+  std::uint64_t _heard = 0;
+  std::shared_ptr<const config::OwnersWord> _word = std::make_shared<const config::OwnersWord>();
   std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };

@@ -57,8 +57,11 @@ class DashboardBackend final : public VeltraBackend {
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
+  std::vector<std::string> hosts() const override;
 
  private:
+  void dropWaiting() override;
+
   DashboardBackend(const DashboardMaking& making, const std::string& name,
                    const config::DashboardProfile* profile, const std::string& productFamily);
 

@@ -107,6 +107,12 @@ void NetworkProcQueue::end() {
   cleanupSources();
 }
 
+void NetworkProcQueue::dropWaiting() {
+  const Lock held(_mutex);
+  _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
+  _messageQueue.clear();
+}
+
 // `reason` applies to the datagrams that were sent.
 void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();

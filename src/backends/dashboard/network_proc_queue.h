@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 #include <string_view>
 
 #include "backends/dashboard/delivery_schedule.h"
@@ -38,6 +39,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     bool reliableUDP = false;
     bool shared = false;
     std::chrono::milliseconds period{};
+    // The dashboard's address, for those who ask whether it may be reached.
+    std::string host;
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -57,6 +60,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void cleanup();
   // Gives up what waits, to make room for other queues, unless a back end has joined.
   void end();
+  // Gives up what waits.
+  void dropWaiting();
+  const std::string& host() const { return _kind.host; }
   bool reliableUDP() const { return _kind.reliableUDP; }
 
  private:
