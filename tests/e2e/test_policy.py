@@ -1,5 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
 """What the owner of the device says in policy.json, on open sessions and before anything leaves."""
+import hmac
 import json
 import time
 
@@ -108,14 +109,15 @@ class Policy(HTTPSTest):
             event = self.lab.wait_for_events(1, kept=1)[0]
             self.lab.received("dashboard", 2)
             session.ask("flushMessagesWithCompletion:")
-        digest = event["number"]
-        self.assertRegex(digest, "^[0-9a-f]{64}$")
+        secret = (self.root.path / "var/lib/veltrad/secret").read_bytes()
+        digest = {text: hmac.new(secret, text.encode(), "sha256").hexdigest() for text in ("hidden-info", "hidden-number")}
+        self.assertEqual(event["number"], digest["hidden-info"])
         self.assertNotIn("secret", event)
         seen = json.dumps([self.lab.received(kind) for kind in ("events", "dashboard", "logdata")]) + "\n".join(daemon.text)
         logs = [path for path in self.root.path.rglob("*") if path.is_file() and "etc" not in path.parts]
         for text in [seen, *(path.read_bytes().decode("latin-1") for path in logs)]:
             self.assertNotIn("hidden", text)
-        self.assertIn(digest, (self.root.path / "var/log/veltrad/energy.jsonl").read_text())
+        self.assertIn(digest["hidden-number"], (self.root.path / "var/log/veltrad/energy.jsonl").read_text())
 
     def test_a_broken_policy_closes_everything_and_says_where(self):
         with self.serving("Policy could not be read") as daemon:
