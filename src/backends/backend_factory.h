@@ -19,6 +19,10 @@
 #include "support/device_identity.h"
 #include "support/veltra.h"
 
+namespace veltrad::config {
+class OwnerGate;
+}  // namespace veltrad::config
+
 namespace veltrad::backends {
 
 class CodeBundle;
@@ -26,7 +30,7 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 15 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 16 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -46,6 +50,8 @@ struct BackendServices {
   std::string scratchDirectory = "/tmp";
   // Null: every sampling factor is drawn.
   SamplingFactors* sampling = nullptr;
+  // Null: the owner sets no limits.
+  config::OwnerGate* gate = nullptr;
 };
 
 // A back end's section of a storebag. Null for a back end that reads no section.

@@ -36,8 +36,9 @@ std::optional<wire::Reason> OwnersWord::refusalFor(std::string_view backend,
   return reaches ? std::nullopt : std::optional(wire::Reason::policy_hosts);
 }
 
-OwnerGate::OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret)
-    : _policy(policy), _preferences(preferences), _secret(secret) {}
+OwnerGate::OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret,
+                     DailyAllowance& allowance)
+    : _policy(policy), _preferences(preferences), _secret(secret), _allowance(allowance) {}
 
 bool OwnerGate::refresh() {
   auto policy = _policy.current();
@@ -75,6 +76,15 @@ std::optional<http::RequestRefusal> OwnerGate::refusal(bool forStorebag, std::st
   if (!reason && !now->policy->reaches(host)) reason = wire::Reason::policy_hosts;
   if (!reason) return std::nullopt;
   return http::RequestRefusal{*reason, textOf(*reason)};
+}
+
+std::optional<http::RequestRefusal> OwnerGate::count(std::uint64_t events, std::uint64_t bytes) {
+  if (mayLeave(events, bytes)) return std::nullopt;
+  return http::RequestRefusal{wire::Reason::over_daily_limit, textOf(wire::Reason::over_daily_limit)};
+}
+
+bool OwnerGate::mayLeave(std::uint64_t events, std::uint64_t bytes) {
+  return _allowance.take(word()->policy->rules(), events, bytes);
 }
 
 }  // namespace veltrad::config

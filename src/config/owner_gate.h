@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "base/mutex.h"
+#include "config/daily_allowance.h"
 #include "config/field_rules.h"
 #include "config/owner_policy.h"
 #include "http/request_gate.h"
@@ -41,7 +42,8 @@ struct OwnersWord {
 class OwnerGate final : public http::RequestGate {
  public:
   // The arguments outlive it. Nothing may leave before the first refresh().
-  OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret);
+  OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret,
+            DailyAllowance& allowance);
 
   // Reads again what has changed. True if the word is another one.
   bool refresh();
@@ -51,11 +53,15 @@ class OwnerGate final : public http::RequestGate {
   std::uint64_t turn() const { return _turn.load(std::memory_order_acquire); }
   // A request for a storebag is asked for its host alone.
   std::optional<http::RequestRefusal> refusal(bool forStorebag, std::string_view host) const override;
+  std::optional<http::RequestRefusal> count(std::uint64_t events, std::uint64_t bytes) override;
+  // The same for datagrams and other things that are no request.
+  bool mayLeave(std::uint64_t events, std::uint64_t bytes);
 
  private:
   OwnerPolicy& _policy;
   platform::Preferences& _preferences;
   platform::DeviceSecret& _secret;
+  DailyAllowance& _allowance;
   std::atomic<std::uint64_t> _turn{0};
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::shared_ptr<const OwnersWord> _word GUARDED_BY(_mutex) = std::make_shared<const OwnersWord>();

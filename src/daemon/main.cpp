@@ -120,6 +120,12 @@ platform::StateFile::State countersState(const platform::Counters& counters, dou
           [&counters, started] { return counters.json(started); }};
 }
 
+// Never written before the first thing has left.
+platform::StateFile::State allowanceState(const config::DailyAllowance& allowance) {
+  return {"The day's account", [&allowance] { return platform::StateFile::Version{allowance.version()}; },
+          [&allowance] { return allowance.text(); }};
+}
+
 platform::StateFile::State metricsState(daemon::Observers& observers) {
   const auto version = [&observers] {
     const daemon::Gauges gauges = observers.gauges();
@@ -129,8 +135,14 @@ platform::StateFile::State metricsState(daemon::Observers& observers) {
   return {"The metrics", version, [&observers] { return observers.metricsText(); }};
 }
 
+struct StateFiles {
+  platform::StateFile& counters;
+  platform::StateFile& metrics;
+  platform::StateFile& allowance;
+};
+
 void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
-           platform::StateFile& countersFile, platform::StateFile& metricsFile, platform::RunLoop& loop) {
+           const StateFiles& files, platform::RunLoop& loop) {
   daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
@@ -143,8 +155,10 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
     daemon.hearOwner();
     if (++ownerTicks < kOwnerTicks) return;
     ownerTicks = 0;
-    countersFile.writeSoon();
-    metricsFile.writeSoon();
+    services.allowance.load();
+    files.counters.writeSoon();
+    files.metrics.writeSoon();
+    if (services.allowance.version() > 0) files.allowance.writeSoon();
     // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
     const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
                       services.memory.used() == 0 && services.http.underWay() == 0;
@@ -170,7 +184,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
 // then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
 bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& control,
-          platform::StateFile& countersFile) {
+          const StateFiles& files) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
@@ -179,7 +193,8 @@ bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& co
   services.http.drain(deadline - 500ms);
   services.pool.drain(deadline - 300ms);
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
-  const bool written = countersFile.writeLast(deadline - 100ms);
+  if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
+  const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
   if (!written) logWarning("main: the disk did not take everything within the time of a stop");
   return stuck == 0 && written;
@@ -227,6 +242,9 @@ int main(int count, char** arguments) {
   services.writer.start();
   platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
                                    services.root.countersPath());
+  platform::StateFile allowanceFile(allowanceState(services.allowance), services.files, services.writer,
+                                    services.root.allowancePath());
+  services.allowance.load();
   services.gate.refresh();
   daemon::Daemon daemon(services);
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
@@ -244,9 +262,10 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon, listener, countersFile, metricsFile, loop);
+  const StateFiles files{countersFile, metricsFile, allowanceFile};
+  serve(services, daemon, listener, files, loop);
 
-  const bool ended = stop(services, listener, control, countersFile);
+  const bool ended = stop(services, listener, control, files);
   daemon.backends().sayRest();
   platform::VeltraLogging::stopLogging();
   if (!ended) _exit(0);

@@ -26,7 +26,7 @@
 
 namespace veltrad::daemon {
 
-// Its 22 fields are the services of the whole process.
+// Its 23 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),
@@ -39,7 +39,8 @@ struct Services {
         adaptorBundle(root.adaptorBundleDirectory(), "PellmarchPerformance"),
         secret(files, root.secretPath()),
         policy(files, root.policyPath()),
-        gate(policy, preferences, secret),
+        allowance(files, clock, root.allowancePath()),
+        gate(policy, preferences, secret, allowance),
         http({root.extraCertificatesPath(), &gate}) {}
 
   const platform::Root root;
@@ -60,6 +61,7 @@ struct Services {
   backends::CodeBundle adaptorBundle;
   platform::DeviceSecret secret;
   config::OwnerPolicy policy;
+  config::DailyAllowance allowance;
   config::OwnerGate gate;
   http::CurlHTTPClient http;
   backends::WorkPool pool;

@@ -66,6 +66,8 @@ struct CurlHTTPClient::Impl {
   void run();
   void stop(const HTTPQueue::Predicate& matches);
   std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
+  std::optional<HTTPError> overLimit(CurlTransfer& transfer) const;
+  static std::optional<HTTPError> asError(std::optional<RequestRefusal> refused);
   void endRefused(bool alsoRunning);
   Transfers takeRefused();
   void startNext();
@@ -84,7 +86,7 @@ struct CurlHTTPClient::Impl {
   // Once it is true, `multi` and `thread` do not change.
   std::atomic<bool> started{false};
   Connections connections;
-  const RequestGate* const gate;
+  RequestGate* const gate;
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
   ServerRecords records;
@@ -171,7 +173,17 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
 
 std::optional<HTTPError> CurlHTTPClient::Impl::refusalOf(const CurlTransfer& transfer) const {
   if (gate == nullptr) return std::nullopt;
-  auto refused = gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName());
+  return asError(gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName()));
+}
+
+// Once for each request, also if it begins anew on another connection.
+std::optional<HTTPError> CurlHTTPClient::Impl::overLimit(CurlTransfer& transfer) const {
+  if (gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag || !transfer.beginsFirst())
+    return std::nullopt;
+  return asError(gate->count(transfer.events(), transfer.bodySize()));
+}
+
+std::optional<HTTPError> CurlHTTPClient::Impl::asError(std::optional<RequestRefusal> refused) {
   if (!refused) return std::nullopt;
   HTTPError error{HTTPError::Kind::refused, std::move(refused->text)};
   error.refusal = refused->reason;
@@ -225,6 +237,7 @@ void CurlHTTPClient::Impl::startNext() {
 
 void CurlHTTPClient::Impl::startOne(Transfers one) {
   if (auto refused = refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
+  if (auto refused = overLimit(one.front())) return end(std::move(one), Failure{std::move(*refused)});
   Easy easy(nullptr, curl_easy_cleanup);
   if (idleHandles.empty()) {
     easy.reset(curl_easy_init());

@@ -48,6 +48,8 @@ struct HTTPRequest {
   // What the request and its completion keep, charged by the caller and released after the completion has
   // run.
   platform::Charge charge;
+  // Events in the body; a file and log data are one.
+  std::size_t events = 1;
   // If false, the answer's body is discarded; one that is too large ends the connection, but the status
   // counts.
   bool keepsAnswer = true;
@@ -113,7 +115,7 @@ struct HTTPClientSettings {
   // Certificates in PEM form that are trusted besides the system's. The file may be missing.
   std::string extraCertificatesPath;
   // Asked on the HTTP thread before each request begins; outlives the client. Null: every request may.
-  const RequestGate* gate = nullptr;
+  RequestGate* gate = nullptr;
 };
 
 // The host that a request to this URL would contact, without port; empty if it names none. By libcurl's own

@@ -2,6 +2,7 @@
 // Decides whether a request may leave the device. Any thread; asked before each request begins.
 #pragma once
 
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -21,6 +22,9 @@ class RequestGate {
   virtual ~RequestGate() = default;
   // `host`: as the URL has it, without port. Nothing: it may begin.
   virtual std::optional<RequestRefusal> refusal(bool forStorebag, std::string_view host) const = 0;
+  // Asked once for each request that may begin, but for a storebag's: counts it for the owner's limits of a
+  // day, or refuses it. `bytes`: of its body.
+  virtual std::optional<RequestRefusal> count(std::uint64_t events, std::uint64_t bytes) = 0;
 };
 
 }  // namespace veltrad::http

@@ -26,6 +26,7 @@ class Root {
   std::string lockPath() const { return path("run/veltrad/lock"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
+  std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }

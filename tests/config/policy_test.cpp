@@ -8,6 +8,7 @@
 #include <tuple>
 #include <vector>
 
+#include "config/daily_allowance.h"
 #include "config/field_rules.h"
 #include "configuration.h"
 #include "formats/json.h"
@@ -107,6 +108,46 @@ TEST(Policy, MakesTheBackendsAndReachesTheHostsThatItNames) {
       {R"({"hosts": ["[::1]"]})", "::1", true}};
   for (const auto& [text, host, reached] : rows) {
     EXPECT_EQ(owner.says(text).reaches(host), reached) << text << ' ' << host;
+  }
+}
+
+TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
+  struct : platform::Clock {
+    double seconds = 20'000 * 86'400.0;
+    platform::TimeValue now() const override { return {static_cast<std::int64_t>(seconds), 0}; }
+  } clock;
+  FakeFileStore files;
+  config::PolicyRules events, bytes, both;
+  events.dailyEvents = 3;
+  bytes.dailyBytes = 100;
+  both.dailyEvents = 9;
+  both.dailyBytes = 120;
+  config::DailyAllowance day(files, clock, "/daily");
+  EXPECT_TRUE(day.take({}, 1, 10));
+  EXPECT_FALSE(day.take(events, 1, 0));  // not read yet
+  files.runShort(true);
+  day.load();
+  EXPECT_FALSE(day.take(events, 1, 0));
+  files.runShort(false);
+  day.load();
+  EXPECT_TRUE(day.take(events, 2, 80));
+  EXPECT_FALSE(day.take(events, 1, 0));
+  EXPECT_TRUE(day.take(events, 0, 10));
+  EXPECT_FALSE(day.take(bytes, 0, 1));
+  files.put("/daily", day.text());
+  config::DailyAllowance next(files, clock, "/daily");
+  EXPECT_TRUE(next.take({}, 4, 10));
+  next.load();
+  EXPECT_FALSE(next.take(both, 3, 0));
+  EXPECT_TRUE(next.take(both, 2, 10));
+  EXPECT_FALSE(next.take(both, 0, 1));
+  clock.seconds += 86'400;
+  EXPECT_TRUE(next.take(both, 9, 120));
+  for (const char* text : {"", "[]", R"({"day": "x"})", R"({"day": 19999, "events": 9})"}) {
+    files.put("/daily", text);
+    config::DailyAllowance fresh(files, clock, "/daily");
+    fresh.load();
+    EXPECT_TRUE(fresh.take(both, 9, 120)) << text;
   }
 }
 

@@ -127,3 +127,25 @@ class Policy(HTTPSTest):
             wait_until(lambda: session.states(**WHO) == [], "no back ends")
             self.forget()
             wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends again")
+
+    def test_a_days_limits_hold_over_a_restart_and_for_all_destinations(self):
+        self.say(dailyEvents=6)  # each message: a post and a datagram; the session's own messages too
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            session = self.client()
+            for number in range(4):
+                session.message(number=number)
+            session.close()
+            wait_until(lambda: self.stats().get("event dropped: the owner's limit for the day is used up"), "a drop")
+        counts = self.counts()
+        left = counts["event posted"] + counts["datagram sent"]
+        self.assertEqual(left, 6)
+        self.assertEqual(json.loads((self.root.path / "var/lib/veltrad/daily.json").read_text())["events"], 6)
+        before = self.arrived()
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=5)
+            self.assertEqual(self.arrived(), before)
+            self.say(dailyEvents=6, dailyBytes=10**6)
+        self.say(dailyBytes=1)
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=6)
+        self.assertEqual(self.arrived(), before)

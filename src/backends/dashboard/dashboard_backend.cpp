@@ -90,7 +90,7 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, server.host()};
+  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, server.host(), making.gate};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {

@@ -29,6 +29,7 @@ struct DashboardMaking {
   std::shared_ptr<DashboardQueues> queues;
   std::shared_ptr<platform::MemoryAccount> account;
   bool oneShot = false;
+  config::OwnerGate* gate = nullptr;
 };
 
 // The initialisers return null, after one error line, if the back end cannot work.

@@ -18,6 +18,7 @@
 #include "backends/dashboard/udp_socket.h"
 #include "backends/lock_ranks.h"
 #include "base/mutex.h"
+#include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/memory_budget.h"
 
@@ -41,6 +42,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::chrono::milliseconds period{};
     // The dashboard's address, for those who ask whether it may be reached.
     std::string host;
+    // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
+    config::OwnerGate* gate = nullptr;
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -73,6 +76,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
+  bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);
