@@ -63,9 +63,10 @@ std::optional<std::string> FieldRules::digest(const Value& value) const {
   return hex({reinterpret_cast<const char*>(bytes), length});
 }
 
-void FieldRules::apply(Dictionary& message, EditedFields& changes) const {
-  if (empty()) return;
-  if (auto changed = edited(message, changes)) message = std::move(*changed);
+bool FieldRules::apply(Dictionary& message, EditedFields& changes) const {
+  auto changed = empty() ? std::nullopt : edited(message, changes);
+  if (changed) message = std::move(*changed);
+  return changed.has_value();
 }
 
 void FieldRules::apply(Value& value, EditedFields& changes) const {

@@ -30,7 +30,8 @@ class FieldRules {
   // True if a field of this name is removed.
   bool removes(std::string_view name) const;
   // Changes the message in place; one without such fields stays the same shared object.
-  void apply(Dictionary& message, EditedFields& changes) const;
+  // False if there were none.
+  bool apply(Dictionary& message, EditedFields& changes) const;
   void apply(Value& value, EditedFields& changes) const;
   // The value that stands for one that is to be hashed: the HMAC-SHA-256 of a text, or of the JSON text of
   // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed.

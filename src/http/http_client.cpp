@@ -9,7 +9,6 @@
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <map>
 #include <new>
 #include <system_error>
 #include <thread>
@@ -19,6 +18,7 @@
 #include "base/value.h"
 #include "http/connections.h"
 #include "http/curl_transfer.h"
+#include "http/gatekeeper.h"
 #include "http/http_queue.h"
 #include "platform/log.h"
 
@@ -65,11 +65,7 @@ struct CurlHTTPClient::Impl {
 
   void run();
   void stop(const HTTPQueue::Predicate& matches);
-  std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
-  std::optional<HTTPError> overLimit(CurlTransfer& transfer) const;
-  static std::optional<HTTPError> asError(std::optional<RequestRefusal> refused);
   void endRefused(bool alsoRunning);
-  Transfers takeRefused();
   void startNext();
   void startOne(Transfers one);
   bool begins(CURL* easy, CurlTransfer& transfer);
@@ -86,7 +82,7 @@ struct CurlHTTPClient::Impl {
   // Once it is true, `multi` and `thread` do not change.
   std::atomic<bool> started{false};
   Connections connections;
-  RequestGate* const gate;
+  const Gatekeeper gate;
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
   ServerRecords records;
@@ -171,59 +167,22 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
   }
 }
 
-std::optional<HTTPError> CurlHTTPClient::Impl::refusalOf(const CurlTransfer& transfer) const {
-  if (gate == nullptr) return std::nullopt;
-  return asError(gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName()));
-}
-
-// Once for each request, also if it begins anew on another connection.
-std::optional<HTTPError> CurlHTTPClient::Impl::overLimit(CurlTransfer& transfer) const {
-  if (gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag || !transfer.beginsFirst())
-    return std::nullopt;
-  return asError(gate->count(transfer.events(), transfer.bodySize()));
-}
-
-std::optional<HTTPError> CurlHTTPClient::Impl::asError(std::optional<RequestRefusal> refused) {
-  if (!refused) return std::nullopt;
-  HTTPError error{HTTPError::Kind::refused, std::move(refused->text)};
-  error.refusal = refused->reason;
-  return error;
-}
-
 // One that is missed for lack of memory is refused when it would begin.
 void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
   try {
-    for (Transfers taken = takeRefused(); !taken.empty();) {
+    for (Transfers taken = gate.takeRefused(queue); !taken.empty();) {
       Transfers one = HTTPQueue::pop(taken, taken.begin());
       // What was refused a moment ago is not put back if the gate has opened since.
       const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
-      HTTPError refused = refusalOf(one.front()).value_or(before);
+      HTTPError refused = gate.refusalOf(one.front()).value_or(before);
       complete(std::move(one), Failure{std::move(refused)});
     }
     for (auto next = running.begin(); alsoRunning && next != running.end();) {
       const auto at = next++;
-      if (auto refused = refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
+      if (auto refused = gate.refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
     }
   } catch (const std::bad_alloc&) {
   }
-}
-
-// The gate is not asked under the queue's lock, so the hosts are collected first.
-CurlHTTPClient::Impl::Transfers CurlHTTPClient::Impl::takeRefused() {
-  using Key = std::pair<bool, std::string>;
-  const auto keyOf = [](const CurlTransfer& transfer) {
-    return Key(transfer.lane() == HTTPRequest::Lane::storebag, transfer.host());
-  };
-  std::map<Key, bool> refused;
-  queue.take([&](const CurlTransfer& transfer) {
-    refused.try_emplace(keyOf(transfer), false);
-    return false;
-  });
-  for (auto& [key, is] : refused) is = gate && gate->refusal(key.first, hostName("https://" + key.second));
-  return queue.take([&](const CurlTransfer& transfer) {
-    const auto found = refused.find(keyOf(transfer));
-    return found != refused.end() && found->second;
-  });
 }
 
 void CurlHTTPClient::Impl::startNext() {
@@ -236,8 +195,8 @@ void CurlHTTPClient::Impl::startNext() {
 }
 
 void CurlHTTPClient::Impl::startOne(Transfers one) {
-  if (auto refused = refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
-  if (auto refused = overLimit(one.front())) return end(std::move(one), Failure{std::move(*refused)});
+  if (auto refused = gate.refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
+  if (auto refused = gate.overLimit(one.front())) return end(std::move(one), Failure{std::move(*refused)});
   Easy easy(nullptr, curl_easy_cleanup);
   if (idleHandles.empty()) {
     easy.reset(curl_easy_init());

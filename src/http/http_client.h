@@ -14,6 +14,7 @@
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
+#include "http/host_name.h"
 #include "http/request_gate.h"
 #include "http/server_records.h"
 #include "platform/memory_budget.h"
@@ -117,10 +118,6 @@ struct HTTPClientSettings {
   // Asked on the HTTP thread before each request begins; outlives the client. Null: every request may.
   RequestGate* gate = nullptr;
 };
-
-// The host that a request to this URL would contact, without port; empty if it names none. By libcurl's own
-// parser, so that nobody's idea of an address differs from where the request goes.
-std::string hostName(const std::string& url);
 
 // "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
 std::string transportLibraries();

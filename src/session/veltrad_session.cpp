@@ -48,7 +48,8 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
       _sessionDelegate(delegate),
       _sessionIDString(std::move(sessionIDString)),
       _account(connection->memoryAccount()),
-      _aggregation(std::make_shared<Aggregation>(std::move(connection))) {
+      _aggregation(std::make_shared<Aggregation>(std::move(connection))),
+      _word(services.gate) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
 
@@ -92,26 +93,16 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
 void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
   _userInfo = std::move(info);
-  _sentUserInfo = allowed(_userInfo);
+  _sentUserInfo = _word.allowed(_userInfo);
 }
 
 void VeltradSession::hearOwner() {
-  while (_services.gate.turn() != _heard) {
-    _heard = _services.gate.turn();
-    _word = _services.gate.word();
-    _sentUserInfo = allowed(_userInfo);
+  while (_word.hear()) {
+    _sentUserInfo = _word.allowed(_userInfo);
     if (!_backends) continue;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
     updateSessionWithDefaultSessionInfo();
   }
-}
-
-backends::SharedDictionary VeltradSession::allowed(const backends::SharedDictionary& userInfo) const {
-  if (!userInfo || !_word->fields) return userInfo;
-  Dictionary sent = *userInfo;
-  config::EditedFields changes;
-  _word->fields->apply(sent, changes);
-  return std::make_shared<const Dictionary>(std::move(sent));
 }
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
@@ -143,7 +134,7 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   facts.sentUserInfo = _sentUserInfo;
   facts.combinedSessionIDString = _sessionIDString;
   auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock,
-                              _services.counters, *_word, _account},
+                              _services.counters, _word.now(), _account},
                              &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   // Clean up the back ends that a second start has replaced.
@@ -160,7 +151,7 @@ void VeltradSession::updateSessionWithDefaultSessionInfo() {
   _sessionDelegate.updateDownstreamSessions(familyFacts());
   // After the daemon was told of the back ends: a word that came before that is heard here, a later one
   // there.
-  if (_backends) forbidByWord(*_backends, *_word);
+  if (_backends) forbidByWord(*_backends, _word.now());
 }
 
 std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
@@ -265,13 +256,9 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   }
   const auto category16 = static_cast<std::uint16_t>(*category);
   const auto type16 = static_cast<std::uint16_t>(*type);
-  const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
-  std::optional<Dictionary> allowedPayload;
-  if (payload && _word->fields) {
-    config::EditedFields changes;
-    _word->fields->apply(allowedPayload.emplace(*payload), changes);
-    payload = &*allowedPayload;
-  }
+  std::optional<Dictionary> changed;
+  const Dictionary* payload =
+      _word.allowed(message.dictionary(wire::kVeltraMessageParametersPayload), changed);
   const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
@@ -326,10 +313,7 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   hearOwner();
-  if (_word->fields) {
-    config::EditedFields changes;
-    for (Value& element : logData) _word->fields->apply(element, changes);
-  }
+  _word.restrict(logData);
   const bool uploaded = uploadLogDataArray(_backends.get(), logData);
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
@@ -362,15 +346,13 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
   hearOwner();
-  if (payload && _word->fields) {
-    config::EditedFields changes;
-    _word->fields->apply(*payload, changes);
-  }
-  veltrad::session::sendMessageWithSessionInfo({_services.factory, _services.device, _services.library,
-                                                _services.clock, _services.counters, *_word, _account, true},
-                                               _services.messageLog,
-                                               {kept.get(), identity, allowed(identity), storebag.get(),
-                                                category, type, payload ? &*payload : nullptr});
+  std::optional<Dictionary> changed;
+  veltrad::session::sendMessageWithSessionInfo(
+      {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
+       _word.now(), _account, true},
+      _services.messageLog,
+      {kept.get(), identity, _word.allowed(identity), storebag.get(), category, type,
+       _word.allowed(payload ? &*payload : nullptr, changed)});
   if (reply) reply("finished");
 }
 

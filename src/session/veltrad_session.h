@@ -11,7 +11,6 @@
 
 #include "backends/backend.h"
 #include "base/value.h"
-#include "config/owner_gate.h"
 #include "ipc/connection.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
@@ -19,6 +18,7 @@
 #include "platform/memory_budget.h"
 #include "platform/preferences.h"
 #include "session/backend_set.h"
+#include "session/heard_word.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
 
@@ -83,8 +83,6 @@ class VeltradSession final : public wire::ClientSessionInterface {
 
   // Takes the owner's word over if it has changed, also into the back ends.
   void hearOwner();
-  // The same without what the owner keeps back; null stays null.
-  backends::SharedDictionary allowed(const backends::SharedDictionary& userInfo) const;
   void createBackendsWithStorebag(const config::StorebagSection& storebag);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
@@ -124,8 +122,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   backends::SharedDictionary _userInfo;
   // What of it may leave the device.
   backends::SharedDictionary _sentUserInfo;
-  std::uint64_t _heard = 0;
-  std::shared_ptr<const config::OwnersWord> _word = std::make_shared<const config::OwnersWord>();
+  HeardWord _word;
   std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };

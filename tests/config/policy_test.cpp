@@ -164,7 +164,11 @@ TEST(FieldRules, RemoveAndHashAtAnyDepth) {
                      {"list", Array{deep, Array{Dictionary{{"Number", 7}}}, 3}},
                      {"inner", Dictionary{{"number", Data{"raw"}}, {"plain", true}}}};
   config::EditedFields changes;
-  fields.apply(message, changes);
+  EXPECT_TRUE(fields.apply(message, changes));
+  Dictionary plain{{"plain", Array{Dictionary{{"kept", 1}}}}};
+  config::EditedFields none;
+  EXPECT_FALSE(fields.apply(plain, none));
+  EXPECT_TRUE(none.removed.empty() && none.hashed.empty());
   EXPECT_EQ(formats::writeJSON(message),
             formats::writeJSON(Dictionary{
                 {"number", digest("0170")},
