@@ -61,10 +61,11 @@ void VeltraBackend::setFacts(SharedFacts facts) {
   _facts.swap(facts);
 }
 
-void VeltraBackend::setUserInfoDict(SharedDictionary userInfo) {
+void VeltraBackend::setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
   changed->userInfo = std::move(userInfo);
+  changed->sentUserInfo = std::move(sent);
   _facts = std::move(changed);
 }
 
@@ -83,6 +84,11 @@ std::optional<double> VeltraBackend::samplingThreshold() const {
 void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
   const Lock held(_mutex);
   _samplingThreshold = value;
+}
+
+void VeltraBackend::setProhibition(std::optional<wire::Reason> reason) {
+  _prohibition.store(reason ? static_cast<int>(*reason) : -1, std::memory_order_relaxed);
+  if (reason) dropWaiting();
 }
 
 BackendActivity VeltraBackend::activity() const {

@@ -26,6 +26,7 @@ class Root {
   std::string lockPath() const { return path("run/veltrad/lock"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
+  std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }
@@ -41,6 +42,7 @@ class Root {
   std::string devicePath() const { return path("etc/veltrad/device.plist"); }
   std::string deploymentPath() const { return path("etc/veltrad/deployment.plist"); }
   std::string settingsPath() const { return path("etc/veltrad/settings.json"); }
+  std::string policyPath() const { return path("etc/veltrad/policy.json"); }
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }

@@ -13,6 +13,7 @@ namespace veltrad::session {
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
   backends::SharedDictionary userInfo;
+  backends::SharedDictionary sentUserInfo;
   const config::StorebagSection* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;

@@ -18,6 +18,7 @@
 #include "platform/memory_budget.h"
 #include "platform/preferences.h"
 #include "session/backend_set.h"
+#include "session/heard_word.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
 
@@ -39,6 +40,7 @@ struct SessionServices {
   platform::Counters& counters;
   FlushCounters& flushes;
   support::MessageLog& messageLog;
+  const config::OwnerGate& gate;
 };
 
 // The agent's list and the connection own it. The delegate outlives it.
@@ -79,6 +81,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
+  // Takes the owner's word over if it has changed, also into the back ends.
+  void hearOwner();
   void createBackendsWithStorebag(const config::StorebagSection& storebag);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
@@ -116,6 +120,9 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
   backends::SharedDictionary _userInfo;
+  // What of it may leave the device.
+  backends::SharedDictionary _sentUserInfo;
+  HeardWord _word;
   std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };

@@ -45,7 +45,7 @@ TEST(VeltraBackend, ItsFactsChangeAsAWholeAndOnlyWhereTheyAreToldTo) {
     for (int i = 0; i <= 1000; ++i) backend.setCorrelatedSessionID("ancestor." + std::to_string(i));
   });
   for (int i = 0; i <= 1000; ++i)
-    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}));
+    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}), nullptr);
   other.join();
   const auto now = backend.facts();
   EXPECT_EQ(now->sessionID, 7u);

@@ -23,6 +23,10 @@ AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters,
     : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
 std::optional<std::string> AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (prohibition()) {
+    _counters.count(wire::Reason::backend_disabled);
+    return std::nullopt;
+  }
   if (message.method == 0 || !message.payload || message.payload->empty()) {
     _counters.count(message.method == 0 ? wire::Reason::energy_category_zero
                                         : wire::Reason::energy_payload_empty);

@@ -29,6 +29,7 @@ struct DashboardMaking {
   std::shared_ptr<DashboardQueues> queues;
   std::shared_ptr<platform::MemoryAccount> account;
   bool oneShot = false;
+  config::OwnerGate* gate = nullptr;
 };
 
 // The initialisers return null, after one error line, if the back end cannot work.
@@ -57,8 +58,11 @@ class DashboardBackend final : public VeltraBackend {
   std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
+  std::vector<std::string> hosts() const override;
 
  private:
+  void dropWaiting() override;
+
   DashboardBackend(const DashboardMaking& making, const std::string& name,
                    const config::DashboardProfile* profile, const std::string& productFamily);
 

@@ -34,7 +34,8 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _queues(std::move(queues)),
       _socket(std::move(socket)),
       _messageQueue(kind.reliableUDP, kind.shared,
-                    [this](std::string_view datagram) REQUIRES(_mutex) { return _socket.send(datagram); }),
+                    [this](std::string_view datagram)
+                        REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); }),
       _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
@@ -58,11 +59,20 @@ void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eve
     _counters.count(wire::Reason::ended_before_sent);
     return;
   }
+  // Its bytes are counted with each transmission.
+  if (!mayLeave(1, 0)) {
+    _counters.count(wire::Reason::datagram_over_daily_limit);
+    return;
+  }
   const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
+}
+
+bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
+  return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
 }
 
 // Batched events are dropped for a datagram that will wait for its acknowledgement, but not for one that
@@ -105,6 +115,12 @@ void NetworkProcQueue::end() {
   if (_backEnds > 0 || !_timer) return;
   giveUp(wire::Reason::too_many_linger);
   cleanupSources();
+}
+
+void NetworkProcQueue::dropWaiting() {
+  const Lock held(_mutex);
+  _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
+  _messageQueue.clear();
 }
 
 // `reason` applies to the datagrams that were sent.

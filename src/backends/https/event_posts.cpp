@@ -15,8 +15,8 @@
 namespace veltrad::backends {
 
 namespace {
-wire::Reason reasonOf(http::HTTPError::Kind kind) {
-  switch (kind) {
+wire::Reason reasonOf(const http::HTTPError& error) {
+  switch (error.kind) {
     case http::HTTPError::Kind::transport:
     case http::HTTPError::Kind::tooLarge:
       return wire::Reason::post_failed;
@@ -26,6 +26,9 @@ wire::Reason reasonOf(http::HTTPError::Kind kind) {
       return wire::Reason::post_shortage;
     case http::HTTPError::Kind::stopping:
       return wire::Reason::post_stopped;
+    case http::HTTPError::Kind::refused:
+      return error.refusal == wire::Reason::over_daily_limit ? wire::Reason::over_daily_limit
+                                                             : wire::Reason::refused_by_owner;
   }
   return wire::Reason::post_failed;
 }
@@ -59,6 +62,7 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
   }
   http::HTTPRequest request =
       makePostRequest(facts, *url, std::move(post.json), post.eventMap, {_gzip, compressionLevel()});
+  request.events = post.eventCount;
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
@@ -101,7 +105,7 @@ std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& back
   const int status = result.ok() ? result.value().status : result.error().status;
   const PostVerdict verdict = verdictOfStatus(status);
   const bool answered = result.ok() || verdict.disablesBackend;
-  _counters.count(answered ? verdict.reason : reasonOf(result.error().kind), eventCount);
+  _counters.count(answered ? verdict.reason : reasonOf(result.error()), eventCount);
   if (!verdict.disablesBackend) return error;
   const std::string text =
       fmt::sprintf("backend %s disabled by server %d return code", backEnd.name(), status);

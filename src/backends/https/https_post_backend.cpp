@@ -57,6 +57,18 @@ void HTTPSPostBackend::updateState() {
   setState(_clientState.updateBackendState());
 }
 
+std::vector<std::string> HTTPSPostBackend::hosts() const {
+  std::vector<std::string> hosts;
+  for (const auto& url : {_clientState.links().postURL(), _clientState.links().realtimePostURL()}) {
+    if (url) hosts.push_back(http::hostName(*url));
+  }
+  return hosts;
+}
+
+void HTTPSPostBackend::dropWaiting() {
+  _counters.count(wire::Reason::refused_by_owner, _held->discard());
+}
+
 BackendActivity HTTPSPostBackend::activity() const {
   BackendActivity activity = VeltraBackend::activity();
   activity.held = _held->size();
@@ -86,7 +98,7 @@ std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedM
     }
   }
   Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
-  if (facts->userInfo) event.merge(*facts->userInfo);
+  if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   filterEvent(event);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
@@ -200,8 +212,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     return std::nullopt;
   }
   const auto facts = this->facts();
-  const SharedDictionary& userInfo = facts->userInfo;
-  if (facts->requireUserInfo && !userInfo) {
+  if (facts->requireUserInfo && !facts->userInfo) {
     if (completion)
       completion(std::nullopt, wire::makeReportingError("Can not flush: userInfo is required", -1));
     return std::nullopt;
@@ -209,8 +220,8 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
-  if (userInfo) {
-    Dictionary filtered = *userInfo;
+  if (const SharedDictionary& sent = facts->sentUserInfo) {
+    Dictionary filtered = *sent;
     filterEvent(filtered);
     const std::size_t more = count * sizeOfEvent(filtered).charged;
     if (facts->account && !facts->account->keepMore(taken.charge, more)) {

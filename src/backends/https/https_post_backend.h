@@ -39,8 +39,12 @@ class HTTPSPostBackend final : public VeltraBackend {
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
   BackendActivity activity() const override;
+  std::vector<std::string> hosts() const override;
+  bool hostsAreFixed() const override { return false; }
 
  private:
+  void dropWaiting() override;
+
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
                    std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 

@@ -37,6 +37,10 @@ void MivoBackend::loadAdaptor() {
 }
 
 std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (prohibition()) {
+    _counters.count(wire::Reason::backend_disabled);
+    return std::nullopt;
+  }
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
