@@ -9,16 +9,16 @@
  * No function throws. Only the functions that end in _wait, veltra_session_close and veltra_session_create
  * wait.
  *
- * The daemon's end: when the connection has ended, the session connects again by itself, 0.1 to 30 s after each
- * attempt, and is described and started anew, with the user info that was last given. Calls that no connection
- * has taken a byte of wait until then. Calls that were written and have no answer end with VELTRA_NO_REPLY and
- * are never repeated. After veltra_session_finish there is no further connection.
+ * The daemon's end: when the connection has ended, the session connects again by itself, 0.1 to 30 s after
+ * each attempt, and is described and started anew, with the user info that was last given. Calls that no
+ * connection has taken a byte of wait until then. Calls that were written and have no answer end with
+ * VELTRA_NO_REPLY and are never repeated. After veltra_session_finish there is no further connection.
  *
  * Processes: a session belongs to the process that made it. In a forked child every call returns
  * VELTRA_FORKED; veltra_session_close returns at once, frees what is the child's and leaves the connection to
  * the parent. The child may make sessions of its own. A child that a callback has forked ends when the
- * callback returns. exec closes the descriptors; vfork and posix_spawn need nothing. No signal handler runs on
- * a session's thread, and no function may be called in one.
+ * callback returns. exec closes the descriptors; vfork and posix_spawn need nothing. No signal handler runs
+ * on a session's thread, and no function may be called in one.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -246,8 +246,9 @@ VELTRA_API void veltra_free(char* text);
 VELTRA_API veltra_status veltra_session_describe(veltra_session*, const veltra_session_options* options);
 
 /* Without _wait: does not wait. VELTRA_OK means that the call was accepted and `callback` (unless NULL) will
- * run exactly once; otherwise nothing was sent and the callback will not run. With _wait: waits for the answer
- * and returns its status; without a connection, for at most connect_timeout_ms, and then the call is not sent.
+ * run exactly once; otherwise nothing was sent and the callback will not run. With _wait: waits for the
+ * answer and returns its status; without a connection, for at most connect_timeout_ms, and then the call is
+ * not sent.
  * `*reply` (unless `reply` is NULL) is always set and must be released. */
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
@@ -321,17 +322,17 @@ typedef enum veltra_counter {
   VELTRA_COUNTER_LOST,        /* messages, files and log data that were accepted and then lost */
   VELTRA_COUNTER_CONNECTIONS, /* connections to the daemon that the session has had */
 } veltra_counter;
-/* A message that was accepted (VELTRA_OK, or VELTRA_NO_REPLY of a waiting call) is counted once: by the daemon,
- * which has run it, by VELTRA_COUNTER_LOST, or by what veltra_session_close returns. After the daemon's orderly
- * stop this is exact. After it was killed, what nobody can know counts as lost; of messages without a callback
- * these may be up to 64 more than were under way. 0 for an unknown counter. */
+/* A message that was accepted (VELTRA_OK, or VELTRA_NO_REPLY of a waiting call) is counted once: by the
+ * daemon, which has run it, by VELTRA_COUNTER_LOST, or by what veltra_session_close returns. After the
+ * daemon's orderly stop this is exact. After it was killed, what nobody can know counts as lost; of messages
+ * without a callback these may be up to 64 more than were under way. 0 for an unknown counter. */
 VELTRA_API uint64_t veltra_session_counter(veltra_session*, veltra_counter);
 
-/* Takes at most 2 s to write the waiting calls, on a further connection if need be, and to learn which were run.
- * Then closes the connection, ends open calls with VELTRA_NO_REPLY (their callbacks run before this returns)
- * and frees the session. Returns the number of messages, files and log data that were lost and that
- * VELTRA_COUNTER_LOST has not told. Inside a callback, or with NULL, it does nothing and returns 0. No other call on the session may
- * start after this one; waiting calls end. */
+/* Takes at most 2 s to write the waiting calls, on a further connection if need be, and to learn which were
+ * run. Then closes the connection, ends open calls with VELTRA_NO_REPLY (their callbacks run before this
+ * returns) and frees the session. Returns the number of messages, files and log data that were lost and that
+ * VELTRA_COUNTER_LOST has not told. Inside a callback, or with NULL, it does nothing and returns 0. No other
+ * call on the session may start after this one; waiting calls end. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus
