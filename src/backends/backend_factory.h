@@ -25,7 +25,7 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 15 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 16 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -37,6 +37,7 @@ struct BackendServices {
   EnergyLog& energyLog;
   CodeBundle& adaptorBundle;
   config::ProcessSettings& settings;
+  config::OperatorSettings& choices;
   support::DeviceIdentity& device;
   const support::Veltra& library;
   WorkPool& pool;
@@ -54,7 +55,7 @@ class BackendFactory {
  public:
   explicit BackendFactory(BackendServices services)
       : _services(services),
-        _posts(services.http, services.clock, services.counters),
+        _posts(services.http, services.clock, services.counters, services.choices),
         _logData(services.http, services.counters) {}
   // Returns a back end that has these facts. Null, after one log line, if the name is unknown or the profile
   // is not sufficient. `oneShot`: the back end serves a single message instead of a session.

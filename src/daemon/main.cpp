@@ -46,7 +46,13 @@ constexpr const char* kHelp =
     "(VELTRA_ROOT, VELTRA_LOG, VELTRA_LOG_TARGET, VELTRA_SANDBOX) and from the files under etc/veltrad.\n"
     "\n"
     "  --version  Print the version and exit\n"
-    "  --help     Print this help and exit\n";
+    "  --help     Print this help and exit\n"
+    "\n"
+    "Examples:\n"
+    "  systemctl start veltrad                           the installed daemon, as a user of its own\n"
+    "  VELTRA_ROOT=/tmp/root VELTRA_LOG=debug veltrad    another one, with all its files below /tmp/root\n"
+    "\n"
+    "See veltrad(8), and veltrad(5) for the files and the environment.\n";
 
 // Before any other thread exists.
 void prepareProcess() {

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <utility>
 
+#include "config/operator_settings.h"
 #include "platform/counters.h"
 #include "platform/log.h"
 
@@ -56,7 +57,8 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return;
   }
-  http::HTTPRequest request = makePostRequest(facts, *url, std::move(post.json), post.eventMap, _gzip);
+  http::HTTPRequest request =
+      makePostRequest(facts, *url, std::move(post.json), post.eventMap, {_gzip, compressionLevel()});
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
@@ -72,6 +74,11 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
   if (const auto started = _http.start(std::move(request), answered); !started) {
     answered(Failure{started.error()});
   }
+}
+
+int EventPosts::compressionLevel() {
+  const auto choices = _choices.current();
+  return (choices ? *choices : config::OperatorChoices()).compression.level;
 }
 
 void EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,

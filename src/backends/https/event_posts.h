@@ -14,13 +14,18 @@
 #include "http/http_client.h"
 #include "platform/limited_line.h"
 
+namespace veltrad::config {
+class OperatorSettings;
+}  // namespace veltrad::config
+
 namespace veltrad::backends {
 
 // One object serves all HTTPS post back ends. It outlives them and their posts.
 class EventPosts {
  public:
-  EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters)
-      : _http(http), _clock(clock), _counters(counters) {}
+  EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters,
+             config::OperatorSettings& choices)
+      : _http(http), _clock(clock), _counters(counters), _choices(choices) {}
 
   struct Post {
     std::string json;
@@ -48,12 +53,14 @@ class EventPosts {
   void rest() { _gzip.rest(); }
 
  private:
+  int compressionLevel();
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
                                                    const std::string& url, std::size_t eventCount);
 
   http::HTTPClient& _http;
   const platform::Clock& _clock;
   platform::Counters& _counters;
+  config::OperatorSettings& _choices;
 
   // Shared, so that many sessions log no more lines than one.
   platform::LimitedLine _errorLine{"posts"};

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "base/text.h"
+#include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
 #include "tools/ctl/key_value.h"
 #include "veltra/veltra.h"
@@ -245,6 +246,15 @@ Ending endingOf(const CLI::App& app, const CLI::ParseError& error) {
   return Ending{0, output.str(), ""};
 }
 
+// To complete KEY of `config get KEY` and its like.
+void offerPreferences(tools::CommandLine& line) {
+  for (tools::Argument& argument : line.arguments) {
+    if (argument.names[0] != "KEY") continue;
+    for (const config::PreferenceKey& key : config::preferenceKeys()) argument.choices.push_back(key.name());
+  }
+  for (tools::CommandLine& command : line.commands) offerPreferences(command);
+}
+
 // The texts have been checked.
 void putTogether(const Texts& texts, Options& options) {
   if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
@@ -288,7 +298,9 @@ tools::CommandLine commandLine() {
   Texts texts;
   CLI::App app;
   describe(app, options, texts);
-  return tools::commandLineOf(app);
+  tools::CommandLine line = tools::commandLineOf(app);
+  offerPreferences(line);
+  return line;
 }
 
 }  // namespace veltrad::ctl
