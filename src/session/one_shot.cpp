@@ -36,7 +36,9 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   const platform::TimeValue time = making.clock.now();
   for (const auto& [name, backend] : *set) {
     backend->updateState();
-    const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    const auto [decision, answer] =
+        backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    if (message.outcomes) message.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();
