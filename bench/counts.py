@@ -7,28 +7,35 @@ import pathlib
 import re
 import subprocess
 import sys
+import time
 
 from figures import number
-from place import (BATCHES_OF_50, DATAGRAMS, REFUSED, SINGLE, SOURCE, context_switches, found, page_faults, program, wait_until)
+from place import (BATCHES_OF_50, DATAGRAMS, REFUSED, SINGLE, SOURCE, context_switches, found, page_faults, program)
 
 RECORD = SOURCE / "bench" / "counts.json"
 KINDS = {"message in state 1": REFUSED, "event in a post of 50": BATCHES_OF_50, "event in a post of its own": SINGLE,
          "datagram": DATAGRAMS}
 MESSAGES = 900  # less than the posts that a daemon takes at once
-PATIENCE = 300  # seconds
+PATIENCE, QUIET = 300, 20  # seconds
 GROWTH = 1.05
 # What may come and go without a change of the code.
 NOISE = {"instructions": 0, "page faults": 0.02, "waits": 0.1, "system calls": 0.1}
+
+
+class NothingPosted(Exception):
+    """Under callgrind on a busy machine a handshake can take longer than the daemon waits."""
 
 
 def run(place, client, client_type):
     """Sends, and waits for the posts that no flush waits for."""
     before = place.sink.requests()
     client.run()
-    if client_type == SINGLE:
-        wait_until(lambda: place.sink.requests() - before >= MESSAGES, "every post", PATIENCE)
-    elif client_type == BATCHES_OF_50:
-        assert place.sink.requests() > before, "nothing was posted"
+    wanted = {SINGLE: MESSAGES, BATCHES_OF_50: MESSAGES // 50}.get(client_type, 0)
+    begin = time.monotonic()
+    while place.sink.requests() - before < wanted:
+        if time.monotonic() - begin > QUIET and place.sink.requests() == before:
+            raise NothingPosted()
+        time.sleep(0.01)
 
 
 @contextlib.contextmanager
@@ -43,8 +50,17 @@ def under_callgrind(place, counted, *more):
     counted.append(int(re.search(r"Collected : (\d+)", log.read_text()).group(1)))
 
 
-def instructions_of_messages(place, client_type):
+def instructions_of_messages(place, client_type, tries=5):
     """Instructions for a message whose reply is awaited, without those of the session's start and end."""
+    try:
+        return count_messages(place, client_type)
+    except NothingPosted:
+        if tries == 1:
+            raise
+        return instructions_of_messages(place, client_type, tries - 1)
+
+
+def count_messages(place, client_type):
     counted = []
     with under_callgrind(place, counted, "--instr-atstart=no") as pid:
         with place.client("waits", client_type, 1, MESSAGES) as client:

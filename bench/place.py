@@ -20,16 +20,20 @@ sys.path.insert(0, str(SOURCE / "tests" / "e2e"))
 from harness import ENTITLEMENT, Daemon, Lab, Root, Wire, closed_port, program, storebag, wait_until  # noqa: E402, F401
 
 # Client types, by what becomes of their messages.
-REFUSED, BATCHES_OF_50, UPLOADS, BATCHES_OF_1000, SINGLE, DATAGRAMS, COPIED, CAPTURED = 16, 6, 7, 8, 9, 10, 12, 17
+OVERLOAD, BATCHES_OF_50, UPLOADS, BATCHES_OF_1000, SINGLE, DATAGRAMS, COPIED, REFUSED, CAPTURED = 5, 6, 7, 8, 9, 10, 12, 16, 17
+POSTS_UNDER_OVERLOAD = 20  # a second, which is all that the collector answers then
 NGINX = """daemon off; master_process off; pid {dir}/nginx.pid; error_log {dir}/nginx.log;
 events {{ worker_connections 4096; }}
 http {{ access_log off; client_max_body_size 0; keepalive_requests 100000000; keepalive_timeout 1h;
   client_body_temp_path {dir}/body; proxy_temp_path {dir}/proxy; fastcgi_temp_path {dir}/fastcgi;
-  uwsgi_temp_path {dir}/uwsgi; scgi_temp_path {dir}/scgi;
+  uwsgi_temp_path {dir}/uwsgi; scgi_temp_path {dir}/scgi; limit_req_zone $server_port zone=slow:1m rate={rate}r/s;
   server {{ listen 127.0.0.1:{port} ssl backlog=4096; ssl_certificate {lab}/certificate.pem;
     ssl_certificate_key {lab}/certificate-key.pem;
-    location / {{ default_type application/json; return 200 '{{"took":1,"errors":false,"items":[]}}'; }}
-    location /kept/ {{ client_body_in_file_only on; proxy_set_body off; proxy_pass http://127.0.0.1:{status}/answer; }} }}
+    location / {{ default_type application/json; return 200 '{{"took":1,"errors":false,"items":[]}}'; }} }}
+  server {{ listen 127.0.0.1:{slow} ssl backlog=4096; ssl_certificate {lab}/certificate.pem;
+    ssl_certificate_key {lab}/certificate-key.pem;
+    location / {{ limit_req zone=slow burst=1000000; client_body_in_file_only on; proxy_pass_request_body off;
+      proxy_set_header Content-Length ""; proxy_pass http://127.0.0.1:{status}/answer; }} }}
   server {{ listen 127.0.0.1:{status}; location /status {{ stub_status; }}
     location / {{ default_type application/json; return 200 '{{"took":1,"errors":false,"items":[]}}'; }} }}
 }}
@@ -45,15 +49,17 @@ def found(name, *folders):
 
 
 class Sink:
-    """nginx with TLS, which answers every post at once. Under /kept/ it keeps the bodies in files."""
+    """nginx with TLS, which answers every post at once, and on a slow port POSTS_UNDER_OVERLOAD in a second, whose bodies it keeps
+    in files."""
 
     def __init__(self, lab):
         self.path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-sink-"))
-        self.port, self.status_port = closed_port(), closed_port()
+        self.port, self.slow_port, self.status_port = closed_port(), closed_port(), closed_port()
         (self.path / "nginx.conf").write_text(
-            NGINX.format(dir=self.path, lab=lab.path, port=self.port, status=self.status_port))
+            NGINX.format(dir=self.path, lab=lab.path, port=self.port, slow=self.slow_port,
+                         status=self.status_port, rate=POSTS_UNDER_OVERLOAD))
         self.popen = subprocess.Popen([found("nginx"), "-c", str(self.path / "nginx.conf"), "-e", str(self.path / "nginx.log")])
-        self.url = f"https://localhost:{self.port}"
+        self.url, self.slow_url = (f"https://localhost:{port}" for port in (self.port, self.slow_port))
         wait_until(self._answers, "nginx", also=lambda: (self.path / "nginx.log").read_text())
 
     def _answers(self):
@@ -70,7 +76,7 @@ class Sink:
         return int(re.search(r"requests\s+\d+ \d+ (\d+)", text).group(1)) - self._asked + 1
 
     def bodies(self):
-        """The bodies of posts to /kept/, and forgets them."""
+        """The bodies of posts to the slow port, which it then forgets."""
         for path in sorted((self.path / "body").iterdir()):
             yield path.read_bytes()
             path.unlink()
@@ -117,6 +123,7 @@ class Place:
         entries = {"melkard": {"locale_whitelist": ["FR"]}, "ostvane": {"event_threshold": 49, "expedite": 0},
                    "brevatto": {"event_threshold": 999, "expedite": 0}, "sollwick": {"event_threshold": 49, "expedite": 1},
                    "crovish": {"event_threshold": 49, "expedite": 0, "override_dnu": 0},
+                   "pellmarch": {"event_threshold": 49, "expedite": 0, "post_url": self.sink.slow_url + "/events"},
                    "yarrowin": {"event_threshold": 49, "expedite": 0, "post_url": "${url}/events"}}
         for name, entry in entries.items():
             self.lab.put(name, storebag(backends={"httppost": {"clients": [{**reporting, **entry}]}}))

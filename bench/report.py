@@ -82,6 +82,7 @@ was due.""",
     "Counts": """Of the daemon, for one message whose client waits for each reply. Instructions are counted by callgrind; a wait is
 a voluntary context switch.""",
     "Beside others": """The same events, the same collector (nginx with TLS), the same number of events in a post. Each program is
-configured to read lines or frames from a Unix socket, to parse them, and to post JSON. What is lost is measured with a
-collector that takes a second for each answer.""",
+configured to read messages from a Unix socket, to parse them, to add the same eleven fields and to post JSON on one
+connection at a time, as far as it can; the others get each message as a line of syslog whose text is JSON. Under overload the
+collector answers 20 posts of 50 in a second, each program may keep 51,200 events, and what has arrived is counted there.""",
 }

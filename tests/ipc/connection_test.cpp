@@ -149,6 +149,7 @@ TEST(Stop, RunsFramesThatArrivedWholeSaysHowManyAndTakesNoMore) {
   stopping.join();
   EXPECT_FALSE(std::filesystem::exists(door.root.socketPath()));
   const auto lines = door.journal.lines();
+  // The silent one may have been turned away before it had a session.
   EXPECT_GE(std::count(lines.begin(), lines.end(), "end"), 2);
   EXPECT_EQ(std::count(lines.begin(), lines.end(), "sendMessage 2 2 none"), 1);
   EXPECT_EQ(std::count(lines.begin(), lines.end(), "sendMessage 3 3 none"), 0);
