@@ -25,15 +25,14 @@ void VeltraBackend::updateState() {
   setState({kBackendReporting, wire::Reason::always});
 }
 
-std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
-                                                      platform::TimeValue timestamp, std::uint16_t method,
-                                                      std::uint16_t respCode, std::int32_t flag) {
+Sent VeltraBackend::sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag) {
   ++_eventID;
   return sendNumberedMessage({payload, timestamp, method, respCode, _eventID, flag});
 }
 
-std::optional<std::string> VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
-  return std::nullopt;
+Sent VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
+  return {};
 }
 
 // Back ends that override it keep the completion, hence by value.

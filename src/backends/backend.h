@@ -20,6 +20,7 @@
 #include "platform/counters.h"
 #include "platform/random.h"
 #include "wire/error.h"
+#include "wire/fates.h"
 #include "wire/reasons.h"
 
 namespace veltrad::backends {
@@ -45,6 +46,12 @@ struct BackendActivity {
   std::size_t held = 0;      // events that wait for a flush, datagrams that wait for the socket
   std::size_t underWay = 0;  // posts without an answer, datagrams without an acknowledgement
   std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
+};
+
+// What a back end has decided for a message, and the text about what it has sent, if there is one.
+struct Sent {
+  wire::Decision decision;
+  std::optional<std::string> text;
 };
 
 // The payload may be null.
@@ -73,10 +80,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual void cleanup() {}
   virtual void updateState();
 
-  // Numbers the message (1, 2, … 65535, 0, …) and passes it on. Returns a text about what was sent.
-  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
-  virtual std::optional<std::string> sendNumberedMessage(const NumberedMessage& message);
+  // Numbers the message (1, 2, … 65535, 0, …) and passes it on.
+  Sent sendMessage(const Dictionary* payload, platform::TimeValue timestamp, std::uint16_t method,
+                   std::uint16_t respCode, std::int32_t flag);
+  // By default the back end takes no messages.
+  virtual Sent sendNumberedMessage(const NumberedMessage& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);

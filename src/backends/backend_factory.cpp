@@ -77,6 +77,7 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
   }
 #endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
+  _services.counters.count(wire::Reason::unknown_backend);
   return nullptr;
 }
 

@@ -16,6 +16,7 @@
 #include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
+#include "platform/counts_record.h"
 #include "platform/log.h"
 #include "platform/process_start.h"
 #include "platform/run_loop.h"
@@ -119,6 +120,22 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   auto control = ipc::openControlSocket(services.root, handedOver.value().control);
   if (!control) return Failure{control.error()};
   return Sockets{std::move(service.value()), std::move(control.value())};
+}
+
+// Counts in a file that outlives a kill, if it can be had.
+void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord>& kept, double started) {
+  auto record = platform::CountsRecord::open(services.root.countsPath(), services.files,
+                                             services.root.countersPath(), started);
+  if (!record) {
+    logWarning("main: What a kill would lose cannot be counted: %s", record.error().c_str());
+    return;
+  }
+  kept.emplace(std::move(record).value());
+  services.counters.countIn(kept->counts());
+  if (const auto lost = services.counters.value(wire::Reason::daemon_ended)) {
+    logInfo("main: the daemon before this one was killed, and %llu events are lost",
+            static_cast<unsigned long long>(lost));
+  }
 }
 
 platform::StateFile::State countersState(const platform::Counters& counters, double started) {
@@ -234,6 +251,8 @@ int main(int count, char** arguments) {
   platform::RunLoop loop;
   loop.blockSignals();
 
+  // Before the services, which count until they end.
+  std::optional<platform::CountsRecord> countsRecord;
   daemon::Services services(platform::Root::fromEnvironment());
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
@@ -244,6 +263,7 @@ int main(int count, char** arguments) {
     return 1;
   }
   removeUnfinishedFiles(services.root);
+  keepCounts(services, countsRecord, started);
 
   services.writer.start();
   platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
@@ -272,6 +292,7 @@ int main(int count, char** arguments) {
   serve(services, daemon, listener, files, loop);
 
   const bool ended = stop(services, listener, control, files);
+  if (ended && countsRecord) countsRecord->told();
   daemon.backends().sayRest();
   platform::VeltraLogging::stopLogging();
   if (!ended) _exit(0);

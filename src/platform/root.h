@@ -24,6 +24,8 @@ class Root {
   // For programs that look after the device.
   std::string controlSocketPath() const { return wire::controlSocketPathUnder(_directory); }
   std::string lockPath() const { return path("run/veltrad/lock"); }
+  // What the counters file shows, for the next daemon if this one is killed.
+  std::string countsPath() const { return path("run/veltrad/counts"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
   std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }

@@ -38,7 +38,9 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   for (const auto& [name, backend] : *set) backend->updateState();
   forbidByWord(*set, making.word);
   for (const auto& [name, backend] : *set) {
-    const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    const auto [decision, answer] =
+        backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    if (message.outcomes) message.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();

@@ -18,6 +18,8 @@ struct OneShotMessage {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   const Dictionary* payload = nullptr;
+  // Gets what became of the message, unless it is null because nobody waits for it.
+  wire::Outcomes* outcomes = nullptr;
 };
 
 // Makes the back ends that the storebag names, updates their states, sends the message with flag 0 through

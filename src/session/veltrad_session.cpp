@@ -204,35 +204,38 @@ void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
 }
 
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                             wire::OptionalDictionary payload, wire::StringReply reply) {
+                                             wire::OptionalDictionary payload, wire::SentReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(category, type, std::move(payload));
-  if (reply) reply(answer);
+  wire::Outcomes outcomes;
+  auto answer = sendMessageWithCategory(category, type, std::move(payload), reply ? &outcomes : nullptr);
+  if (reply) reply(std::move(answer), std::move(outcomes));
 }
 
-void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::StringReply reply) {
+void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::SentReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithDictionary(message, Origin::client);
-  if (reply) reply(answer);
+  wire::Outcomes outcomes;
+  auto answer = sendMessageWithDictionary(message, reply ? &outcomes : nullptr, Origin::client);
+  if (reply) reply(std::move(answer), std::move(outcomes));
 }
 
 void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
   logDebug("finishSessionWithReply: Finishing session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
+  const auto answer = sendMessageWithCategory(0, 2, std::nullopt, nullptr);
   if (reply) reply(answer);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
-                                                                   Origin origin) {
+                                                                   wire::Outcomes* outcomes, Origin origin) {
   Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
                      {wire::kVeltraMessageParametersFlag, 0u},
                      {wire::kVeltraMessageParametersType, unsigned{type}}};
   if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
-  return sendMessageWithDictionary(message, origin);
+  return sendMessageWithDictionary(message, outcomes, origin);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
+                                                                     wire::Outcomes* outcomes,
                                                                      Origin origin) {
   hearOwner();
   if (!_backends) {
@@ -267,12 +270,13 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   if (hierarchy > 0 || _aggregation->active()) {
     aggregateMessage(hierarchy, platform::timevalToSeconds(time), category16, type16, payload);
   }
-  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog);
+  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog,
+                         outcomes);
 }
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), Origin::session);
+  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), nullptr, Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
@@ -321,7 +325,7 @@ void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply compl
 void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
                                                 wire::OptionalDictionary userInfo, std::uint16_t category,
                                                 std::uint16_t type, wire::OptionalDictionary payload,
-                                                wire::StringReply reply) {
+                                                wire::SentReply reply) {
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
@@ -341,19 +345,20 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::no_storebag);
-    if (reply) reply("storebag not available");
+    if (reply) reply("storebag not available", {});
     return;
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
   hearOwner();
   std::optional<Dictionary> changed;
+  wire::Outcomes outcomes;
   veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
        _word.now(), _account, true},
       _services.messageLog,
       {kept.get(), identity, _word.allowed(identity), storebag.get(), category, type,
-       _word.allowed(payload ? &*payload : nullptr, changed)});
-  if (reply) reply("finished");
+       _word.allowed(payload ? &*payload : nullptr, changed), reply ? &outcomes : nullptr});
+  if (reply) reply("finished", std::move(outcomes));
 }
 
 void VeltradSession::end() {

@@ -58,8 +58,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
                                wire::NamesReply completionHandler) override;
   void fetchDisplayURL(wire::StringReply reply) override;
   void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, wire::OptionalDictionary payload,
-                               wire::StringReply reply) override;
-  void sendMessageWithDictionary(Dictionary message, wire::StringReply reply) override;
+                               wire::SentReply reply) override;
+  void sendMessageWithDictionary(Dictionary message, wire::SentReply reply) override;
   void flushMessagesWithCompletion(wire::FlushReply completion) override;
   void finishSessionWithReply(wire::StringReply reply) override;
   void uploadFileAtPath(std::string path, std::string extensionToken,
@@ -67,7 +67,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) override;
   void sendMessageWithSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                   std::uint16_t category, std::uint16_t type,
-                                  wire::OptionalDictionary payload, wire::StringReply reply) override;
+                                  wire::OptionalDictionary payload, wire::SentReply reply) override;
   // Sends the stop message, flushes, and cleans up and releases the back ends.
   void end() override;
   std::string description() const override;
@@ -93,11 +93,13 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // Messages of the session itself are not counted as lost.
   enum class Origin { client, session };
   // These check the message, pass it to the aggregating client and every back end, and return the answer for
-  // the client.
+  // the client. `outcomes` is null if nobody waits for them.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      wire::OptionalDictionary payload,
+                                                     wire::Outcomes* outcomes,
                                                      Origin origin = Origin::client);
-  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, Origin origin);
+  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, wire::Outcomes* outcomes,
+                                                       Origin origin);
   void sayWithoutUserInfo();
   void aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category, std::uint16_t type,
                         const Dictionary* payload);

@@ -77,6 +77,7 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
                                             const Server& server) {
   if (!server.address) {
     logError("DashboardBackend(initWithName): can't resolve server IP");
+    making.counters.count(wire::Reason::bad_address);
     return nullptr;
   }
   const bool reliable = server.reliable && useReliableUDP(socket);
@@ -120,7 +121,10 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const Dashboard
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
     const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
     const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
-  if (profile && !namesServer(*profile)) return nullptr;
+  if (profile && !namesServer(*profile)) {
+    making.counters.count(wire::Reason::bad_address);
+    return nullptr;
+  }
   const Server server = serverOf(profile, serverIP, serverPort);
   auto queue =
       making.oneShot && server.address ? making.queues->join(server.routeOf(making.account.get())) : nullptr;
@@ -158,10 +162,10 @@ DashboardBackend::~DashboardBackend() {
   cleanup();
 }
 
-std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
-  if (prohibition()) {
+Sent DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
-    return std::nullopt;
+    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
   }
   tagReportingPacket packet;
   packet.header = headerOf(message);
@@ -172,8 +176,8 @@ std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedM
   packet.header.invertedLength = htobe16(static_cast<std::uint16_t>(~length));
 
   std::string line = writeLocalLog(packet);
-  _networkProcQueue->tryToSendMsg({reinterpret_cast<const char*>(&packet), length}, message.eventID);
-  return line;
+  const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID), std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {

@@ -54,8 +54,8 @@ class DashboardBackend final : public VeltraBackend {
       const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
-  // Returns the dashboard text line of the message.
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  // The text is the dashboard text line of the message.
+  Sent sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;

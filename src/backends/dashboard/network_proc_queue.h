@@ -21,6 +21,7 @@
 #include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/memory_budget.h"
+#include "wire/fates.h"
 
 namespace veltrad::backends {
 
@@ -55,7 +56,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // From now on acknowledgements are read. False if they cannot be.
   bool startReading(WorkPool& pool);
   // Called without a lock, because older data of the user may be dropped to make room.
-  void tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
+  wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
   // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next

@@ -53,12 +53,13 @@ JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> e
   return makeJSONMessage(postTime, clientID, std::move(events), wantPretty);
 }
 
-void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
-                                 const std::optional<std::string>& url, Post post) {
+std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                                        const SessionFacts& facts,
+                                                        const std::optional<std::string>& url, Post post) {
   if (!url) {
     _counters.count(wire::Reason::post_url_nil, post.eventCount);
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
-    return;
+    return wire::Reason::post_url_nil;
   }
   http::HTTPRequest request =
       makePostRequest(facts, *url, std::move(post.json), post.eventMap, {_gzip, compressionLevel()});
@@ -77,7 +78,9 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
   };
   if (const auto started = _http.start(std::move(request), answered); !started) {
     answered(Failure{started.error()});
+    return reasonOf(started.error());
   }
+  return std::nullopt;
 }
 
 int EventPosts::compressionLevel() {
@@ -85,11 +88,12 @@ int EventPosts::compressionLevel() {
   return (choices ? *choices : config::OperatorChoices()).compression.level;
 }
 
-void EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                            const VeltraBackend::FlushCompletion& completion) {
+wire::Reason EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
+                                    const VeltraBackend::FlushCompletion& completion) {
   const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
   auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount);
   if (completion) completion(std::nullopt, std::move(error));
+  return wire::Reason::too_many_posts;
 }
 
 std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& backEnd,

@@ -55,6 +55,7 @@ std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& m
                                                            const std::string& productFamily) {
   if (!profile || !profile->postURL) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
+    making.counters.count(wire::Reason::no_post_url);
     return nullptr;
   }
   std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile->postURL, productFamily));
