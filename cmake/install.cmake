@@ -8,15 +8,15 @@ set(PYTHON_DIRECTORY lib/python3/dist-packages)
 set(CONFIG_DIRECTORY ${CMAKE_INSTALL_LIBDIR}/cmake/Veltra)
 set(MADE ${PROJECT_BINARY_DIR}/install)
 
-# veltra_install_unit(COMPONENT NAME): a unit, with the programs' place under the prefix.
+# veltra_install_unit(COMPONENT NAME): a unit, with the programs' place under the prefix, which is known at installation only.
 function(veltra_install_unit component name)
-  set(unit ${PROJECT_SOURCE_DIR}/packaging/${name})
-  set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${unit})
-  file(READ ${unit} text)
-  string(REPLACE "=/usr/libexec/" "=${CMAKE_INSTALL_FULL_LIBEXECDIR}/" text "${text}")
-  string(REPLACE "=/usr/bin/" "=${CMAKE_INSTALL_FULL_BINDIR}/" text "${text}")
-  file(CONFIGURE OUTPUT ${MADE}/${name} CONTENT "${text}" @ONLY)
-  install(FILES ${MADE}/${name} DESTINATION ${UNIT_DIRECTORY} COMPONENT ${component})
+  install(CODE "
+    file(READ \"${PROJECT_SOURCE_DIR}/packaging/${name}\" text)
+    string(REPLACE =/usr/libexec/ =\${CMAKE_INSTALL_PREFIX}/${CMAKE_INSTALL_LIBEXECDIR}/ text \"\${text}\")
+    string(REPLACE =/usr/bin/ =\${CMAKE_INSTALL_PREFIX}/${CMAKE_INSTALL_BINDIR}/ text \"\${text}\")
+    file(WRITE \"${MADE}/${name}\" \"\${text}\")
+    file(INSTALL DESTINATION \"\${CMAKE_INSTALL_PREFIX}/${UNIT_DIRECTORY}\" TYPE FILE FILES \"${MADE}/${name}\")"
+    COMPONENT ${component})
 endfunction()
 
 # veltra_install_configuration(COMPONENT FILE DIRECTORY NAME): a file below etc; the prefix is known at installation only.
@@ -27,7 +27,7 @@ function(veltra_install_configuration component file directory name)
     else()
       set(etc \${CMAKE_INSTALL_PREFIX}/etc)
     endif()
-    file(INSTALL DESTINATION \${etc}/${directory} TYPE FILE RENAME ${name} FILES ${file})"
+    file(INSTALL DESTINATION \"\${etc}/${directory}\" TYPE FILE RENAME ${name} FILES \"${file}\")"
     COMPONENT ${component})
 endfunction()
 

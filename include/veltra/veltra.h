@@ -2,14 +2,23 @@
 /* libveltra: report to veltrad from C. See veltra.hpp for C++20.
  *
  * Threads: every function may be called from any thread; calls on one session are carried out in the order in
- * which they were made. Callbacks run one at a time on a thread of the session; a waiting call inside a
- * callback is refused with VELTRA_WOULD_DEADLOCK.
+ * which they were made. Callbacks run one at a time on a thread of the session, which the first call that
+ * needs it starts. In a callback every function may be called, but a waiting call is refused with
+ * VELTRA_WOULD_DEADLOCK, and veltra_session_close does nothing.
  *
  * No function throws. Only the functions that end in _wait, veltra_session_close and veltra_session_create
  * wait.
  *
- * Processes: exec closes the descriptors. After a fork the session belongs to the parent: the child must
- * neither use nor close it, but may open its own. No signal handler runs on a session's thread.
+ * The daemon's end: when the connection has ended, the session connects again by itself, 0.1 to 30 s after
+ * each attempt, and is described and started anew, with the user info that was last given. Calls that no
+ * connection has taken a byte of wait until then. Calls that were written and have no answer end with
+ * VELTRA_NO_REPLY and are never repeated. After veltra_session_finish there is no further connection.
+ *
+ * Processes: a session belongs to the process that made it. In a forked child every call returns
+ * VELTRA_FORKED; veltra_session_close returns at once, frees what is the child's and leaves the connection to
+ * the parent. The child may make sessions of its own. A child that a callback has forked ends when the
+ * callback returns. exec closes the descriptors; vfork and posix_spawn need nothing. No signal handler runs
+ * on a session's thread, and no function may be called in one.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -26,13 +35,14 @@ extern "C" {
 
 typedef enum veltra_status {
   VELTRA_OK = 0,
-  VELTRA_NO_DAEMON = 1,      /* no daemon listens on the socket, or the connection has ended */
+  VELTRA_NO_DAEMON = 1,      /* no daemon listens on the socket, or no further connection is made */
   VELTRA_REFUSED = 2,        /* the daemon refused the connection or the call */
   VELTRA_QUEUE_FULL = 3,     /* the session's queue is full; the call was dropped and counted */
   VELTRA_INVALID = 4,        /* an argument is invalid; nothing was done */
   VELTRA_NO_REPLY = 5,       /* the call ended without an answer */
   VELTRA_WOULD_DEADLOCK = 6, /* a waiting call inside a callback */
   VELTRA_TOO_LARGE = 7,      /* over 1 MiB (log data 16 MiB), 100,000 keys and values, 60 levels; not sent */
+  VELTRA_FORKED = 8,         /* the session belongs to the process that this one was forked from */
 } veltra_status;
 
 /* A short English text for a status, valid for ever. */
@@ -112,6 +122,11 @@ VELTRA_API veltra_status veltra_reply_status(const veltra_reply* reply);
 VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* length);
 /* The back ends that report: an array of texts, or NULL if there are none. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
+/* What has become of a message in each back end when the answer was written: an array of dictionaries with
+ * the texts "backend"; "outcome", which is posted, batched, held, dropped, waiting, sent, written, delivered
+ * or none; "reason", a name for programs; "text", the same for people. Empty if the session has no back ends,
+ * NULL if the call sent no message or the daemon is older. */
+VELTRA_API const veltra_value* veltra_reply_outcomes(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
 /* True if the server has confirmed an uploaded file and the library has removed it. */
 VELTRA_API bool veltra_reply_removed(const veltra_reply* reply);
@@ -132,13 +147,64 @@ typedef struct veltra_session veltra_session;
 typedef void (*veltra_aggregation_callback)(void* context, const veltra_value* session_info, double timestamp,
                                             uint16_t category, uint16_t type, const veltra_value* payload);
 
-/* Its 17 fields are what the daemon is told about the session, and how the library serves it. */
+/* The state of a session's connection. */
+typedef enum veltra_connection_state {
+  VELTRA_STATE_CONNECTING, /* it will connect; said again, with the reason, after each attempt that failed */
+  VELTRA_STATE_CONNECTED,  /* the daemon has accepted the connection */
+  VELTRA_STATE_STARTED,    /* the daemon has answered a start, also one that the library has made again */
+  VELTRA_STATE_LOST,       /* the connection has ended; calls under way end with VELTRA_NO_REPLY */
+  VELTRA_STATE_CLOSED,     /* there will be no further connection */
+} veltra_connection_state;
+
+/* Learns of each change. `backends`: those that report, an array of texts, or NULL; only with
+ * VELTRA_STATE_STARTED. `why`: a text, or NULL. Both are valid until it returns. */
+typedef void (*veltra_state_callback)(void* context, veltra_connection_state, const veltra_value* backends,
+                                      const char* why);
+
+/* The kinds of clients. Each is named after the code that identifies it in reports. */
+typedef enum veltra_client_type {
+  VELTRA_CLIENT_TYPE_PV = 0,
+  VELTRA_CLIENT_TYPE_DR = 1,
+  VELTRA_CLIENT_TYPE_XLN = 2,
+  VELTRA_CLIENT_TYPE_BQ = 3,
+  VELTRA_CLIENT_TYPE_HW = 4,
+  VELTRA_CLIENT_TYPE_ZE = 5,
+  VELTRA_CLIENT_TYPE_FU = 6,
+  VELTRA_CLIENT_TYPE_JY = 7,
+  VELTRA_CLIENT_TYPE_KO = 8,
+  VELTRA_CLIENT_TYPE_WA = 9,
+  VELTRA_CLIENT_TYPE_UT = 10,
+  VELTRA_CLIENT_TYPE_EB = 11,
+  VELTRA_CLIENT_TYPE_MYRT = 12,
+  VELTRA_CLIENT_TYPE_QOLIN = 13,
+  VELTRA_CLIENT_TYPE_FU_GLP = 14,
+  VELTRA_CLIENT_TYPE_FU_TOLMS = 15,
+  VELTRA_CLIENT_TYPE_GARNOVE = 16,
+  VELTRA_CLIENT_TYPE_LIMBET = 17,
+} veltra_client_type;
+
+/* How a message is treated; REALTIME | OVERRIDE_SAMPLING is both. */
+typedef enum veltra_flag {
+  VELTRA_FLAG_NONE = 0,
+  VELTRA_FLAG_REALTIME = 1,          /* posted at once, and what is batched before it */
+  VELTRA_FLAG_OVERRIDE_SAMPLING = 2, /* a back end that sampling holds back reports from now on */
+} veltra_flag;
+
+/* The types of messages of category 0, which are about the session itself. Daemon and library send them. */
+typedef enum veltra_message_kind {
+  VELTRA_MESSAGE_START = 0,
+  VELTRA_MESSAGE_STOP = 1,
+  VELTRA_MESSAGE_FINISH = 2,
+} veltra_message_kind;
+
+/* Its 22 fields are what the daemon is told about the session, and how the library serves it. A program that
+ * was built with an earlier version of the struct goes on. */
 typedef struct veltra_session_options {
   size_t size;      /* sizeof(veltra_session_options), which identifies the version of the struct */
   const char* root; /* the directory that contains run/veltrad; NULL: VELTRA_ROOT, else "/" */
   /* Session info. A key is left out if its has_… is false. */
   bool has_client_type;
-  int32_t client_type; /* 0 to 17 */
+  int32_t client_type; /* 0 to 17: a veltra_client_type */
   bool has_session_id;
   uint32_t session_id;
   bool has_client_version;
@@ -157,6 +223,16 @@ typedef struct veltra_session_options {
   size_t queue_bytes;
   /* Does not describe the session on connecting: for one-shot messages, which contain a description. */
   bool undescribed;
+  /* Neither waits for a daemon nor fails for want of one, a stuck one included: the session connects on its
+   * thread, and its calls wait. */
+  bool connect_later;
+  /* How long the daemon has to accept a connection, and how long a waiting call waits for one; 0: 5,000. */
+  uint32_t connect_timeout_ms;
+  /* If not NULL, learns of each change of the connection's state, on a thread of the session. */
+  veltra_state_callback state_changed;
+  void* state_context;
+  /* An array of names that the daemon is told with the description, or NULL. */
+  const veltra_value* frameworks_to_check;
 } veltra_session_options;
 
 /* Fills in the defaults and `size`. */
@@ -169,14 +245,20 @@ VELTRA_API veltra_session* veltra_session_create(const veltra_session_options* o
                                                  char** error);
 VELTRA_API void veltra_free(char* text);
 
-/* Without _wait: VELTRA_OK means that the call was accepted and `callback` (unless NULL) will run exactly
- * once; otherwise nothing was sent and the callback will not run. With _wait: waits for the answer and
- * returns its status;
+/* Describes a live session anew: session info, user info and frameworks replace the former ones, and the back
+ * ends follow at the next start. If `aggregated` is NULL, the session ends its aggregation; one that was made
+ * without it cannot begin any. The other options stay as the session was made with. Does not wait. */
+VELTRA_API veltra_status veltra_session_describe(veltra_session*, const veltra_session_options* options);
+
+/* Without _wait: does not wait. VELTRA_OK means that the call was accepted and `callback` (unless NULL) will
+ * run exactly once; otherwise nothing was sent and the callback will not run. With _wait: waits for the
+ * answer and returns its status; without a connection, for at most connect_timeout_ms, and then the call is
+ * not sent.
  * `*reply` (unless `reply` is NULL) is always set and must be released. */
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
 
-/* `payload` is a dictionary or NULL. flag: 1 and 3 are realtime, 2 and 3 override sampling, 0 is neither. */
+/* `payload` is a dictionary or NULL. flag: 0 to 3, see veltra_flag. */
 VELTRA_API veltra_status veltra_session_send(veltra_session*, uint16_t category, uint16_t type,
                                              const veltra_value* payload, uint32_t flag, veltra_callback,
                                              void* context);
@@ -233,7 +315,7 @@ VELTRA_API veltra_status veltra_session_finish_wait(veltra_session*, veltra_repl
 
 typedef struct veltra_statistics {
   uint64_t sent;           /* calls written to the daemon */
-  uint64_t dropped;        /* calls lost because the queue was full or the connection had ended */
+  uint64_t dropped;        /* calls that were refused because the queue was full, and those that were lost */
   uint64_t queued;         /* calls that now wait to be written */
   uint64_t replies;        /* answers received */
   uint64_t unanswered;     /* calls that ended without an answer */
@@ -241,10 +323,21 @@ typedef struct veltra_statistics {
 } veltra_statistics;
 VELTRA_API void veltra_session_statistics(veltra_session*, veltra_statistics* statistics);
 
-/* Writes the waiting calls for at most 2 s, closes the connection, ends open calls with VELTRA_NO_REPLY
- * (their callbacks run before this returns) and frees the session. Returns the number of calls that were not
- * written. Inside a callback, or with NULL, it does nothing and returns 0. No other call on the session may
- * start after this one; waiting calls end. */
+typedef enum veltra_counter {
+  VELTRA_COUNTER_LOST,        /* messages, files and log data that were accepted and then lost */
+  VELTRA_COUNTER_CONNECTIONS, /* connections to the daemon that the session has had */
+} veltra_counter;
+/* A message that was accepted (VELTRA_OK, or VELTRA_NO_REPLY of a waiting call) is counted once: by the
+ * daemon, which has run it, by VELTRA_COUNTER_LOST, or by what veltra_session_close returns. After the
+ * daemon's orderly stop this is exact. After it was killed, what nobody can know counts as lost; of messages
+ * without a callback these may be up to 64 more than were under way. 0 for an unknown counter. */
+VELTRA_API uint64_t veltra_session_counter(veltra_session*, veltra_counter);
+
+/* Takes at most 2 s to write the waiting calls, on a further connection if need be, and to learn which were
+ * run. Then closes the connection, ends open calls with VELTRA_NO_REPLY (their callbacks run before this
+ * returns) and frees the session. Returns the number of messages, files and log data that were lost and that
+ * VELTRA_COUNTER_LOST has not told. Inside a callback, or with NULL, it does nothing and returns 0. No other
+ * call on the session may start after this one; waiting calls end. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus

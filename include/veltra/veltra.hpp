@@ -9,6 +9,7 @@
 #ifndef VELTRA_VELTRA_HPP
 #define VELTRA_VELTRA_HPP
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <future>
@@ -27,6 +28,9 @@ namespace veltra {
 // ---- Answers ----
 
 using Status = veltra_status;
+using ClientType = veltra_client_type;
+using Flag = veltra_flag;
+using MessageKind = veltra_message_kind;
 using Statistics = veltra_statistics;
 
 struct Error {
@@ -55,12 +59,32 @@ class Result {
 
 // The back ends that report; absent if there are none.
 using Backends = std::optional<std::vector<std::string>>;
+inline Backends backendsOf(const veltra_value* names) {
+  if (!names) return std::nullopt;
+  Backends made{std::in_place};
+  for (std::size_t i = 0; i < veltra_count(names); ++i) {
+    std::size_t length = 0;
+    const char* name = veltra_get_string(veltra_array_item(names, i), &length);
+    if (name) made->emplace_back(name, length);
+  }
+  return made;
+}
+
+// What has become of a message in one back end: the texts of veltra_reply_outcomes().
+struct Outcome {
+  std::string backend;
+  std::string outcome;
+  std::string reason;
+  std::string text;
+};
 
 // The answer to a call.
 struct Reply {
   Status status = VELTRA_OK;
   std::optional<std::string> text;
   Backends backends;
+  // Absent if the call sent no message or the daemon is older.
+  std::optional<std::vector<Outcome>> outcomes;
   bool uploaded = false;
   // An uploaded file was confirmed and removed.
   bool removed = false;
@@ -74,11 +98,11 @@ struct Reply {
     made.status = veltra_reply_status(reply);
     std::size_t length = 0;
     if (const char* text = veltra_reply_text(reply, &length)) made.text.emplace(text, length);
-    if (const veltra_value* names = veltra_reply_backends(reply)) {
-      made.backends.emplace();
-      for (std::size_t i = 0; i < veltra_count(names); ++i) {
-        const char* name = veltra_get_string(veltra_array_item(names, i), &length);
-        if (name) made.backends->emplace_back(name, length);
+    made.backends = backendsOf(veltra_reply_backends(reply));
+    if (const veltra_value* outcomes = veltra_reply_outcomes(reply)) {
+      made.outcomes.emplace();
+      for (std::size_t at = 0; at < veltra_count(outcomes); ++at) {
+        made.outcomes->push_back(outcomeOf(veltra_array_item(outcomes, at)));
       }
     }
     made.uploaded = veltra_reply_uploaded(reply);
@@ -95,9 +119,22 @@ struct Reply {
     made.error = Error{status, "", -1, veltra_status_text(status)};
     return made;
   }
+
+ private:
+  static Outcome outcomeOf(const veltra_value* given) {
+    const auto text = [given](const char* key) {
+      std::size_t length = 0;
+      const char* found = veltra_get_string(veltra_dictionary_item(given, key), &length);
+      return found ? std::string(found, length) : std::string();
+    };
+    return {text("backend"), text("outcome"), text("reason"), text("text")};
+  }
 };
 
 using Callback = std::function<void(const Reply&)>;
+// See veltra_state_callback; `why` is empty if there is nothing to say.
+using StateHandler =
+    std::function<void(veltra_connection_state state, const Backends& backends, const std::string& why)>;
 
 // ---- Sessions ----
 
@@ -114,7 +151,7 @@ struct Aggregated {
 
 // Absent values are left out of the description of the session.
 struct Options {
-  // 0 to 17.
+  // 0 to 17: a ClientType.
   std::optional<std::int32_t> clientType = {};
   std::optional<std::uint32_t> sessionID = {};
   std::optional<std::uint16_t> clientVersion = {};
@@ -132,18 +169,31 @@ struct Options {
   std::size_t queueBytes = 0;
   // Does not describe the session on connecting: for one-shot messages.
   bool undescribed = false;
+  // Neither waits for a daemon nor fails for want of one.
+  bool connectLater = false;
+  // 0 means 5 s.
+  std::chrono::milliseconds connectTimeout{0};
+  // If not empty, learns of each change of the connection's state.
+  StateHandler stateChanged = {};
+  // An array of names, or nothing.
+  Value frameworksToCheck = {};
 };
 
 // A session. If it could not be made, it is false, error() says why, and it refuses every call.
 class Session {
  public:
-  explicit Session(const Options& options = {}) : _aggregated(sharedHandler(options.aggregated)) {
+  explicit Session(const Options& options = {})
+      : _aggregated(sharedHandler(options.aggregated)), _stateChanged(sharedHandler(options.stateChanged)) {
     veltra_session_options plain = identityOf(options);
     plain.root = text(options.root);
     plain.undescribed = options.undescribed;
     plain.aggregated = _aggregated ? &onAggregated : nullptr;
     plain.aggregated_context = _aggregated.get();
     plain.queue_bytes = options.queueBytes;
+    plain.connect_later = options.connectLater;
+    plain.connect_timeout_ms = static_cast<std::uint32_t>(options.connectTimeout.count());
+    plain.state_changed = _stateChanged ? &onState : nullptr;
+    plain.state_context = _stateChanged.get();
     char* why = nullptr;
     _session = veltra_session_create(&plain, &_error.status, &why);
     if (why) _error.description = why;
@@ -151,10 +201,12 @@ class Session {
   }
   Session(Session&& other) noexcept
       : _aggregated(std::move(other._aggregated)),
+        _stateChanged(std::move(other._stateChanged)),
         _session(std::exchange(other._session, nullptr)),
         _error(std::move(other._error)) {}
   Session& operator=(Session other) noexcept {
     std::swap(_aggregated, other._aggregated);
+    std::swap(_stateChanged, other._stateChanged);
     std::swap(_session, other._session);
     std::swap(_error, other._error);
     return *this;
@@ -181,7 +233,15 @@ class Session {
     return wait(&veltra_session_send_wait, category, type, payload.get(), flag);
   }
 
-  // These do not wait. flag: 1 and 3 are realtime, 2 and 3 override sampling.
+  // Describes the live session anew, with the session info, user info and frameworks of `who`. It ends its
+  // aggregation if `who` has no handler; the handler itself stays. Does not wait.
+  Status describe(const Options& who) {
+    veltra_session_options plain = identityOf(who);
+    plain.aggregated = who.aggregated ? &onAggregated : nullptr;
+    return veltra_session_describe(_session, &plain);
+  }
+
+  // These do not wait. flag: 0 to 3, see Flag.
   std::future<Reply> send(std::uint16_t category, std::uint16_t type, const Dictionary& payload = {},
                           std::uint32_t flag = 0) {
     return promised(
@@ -238,8 +298,9 @@ class Session {
     veltra_session_statistics(_session, &counts);
     return counts;
   }
-  // Returns the number of calls that were not written. The destructor calls it. Not to be called in a
-  // callback.
+  std::uint64_t counter(veltra_counter which) const { return veltra_session_counter(_session, which); }
+  // Returns the number of lost messages that counter() has not told. The destructor calls it. Not to be
+  // called in a callback.
   std::uint64_t close() { return veltra_session_close(std::exchange(_session, nullptr)); }
 
  private:
@@ -263,10 +324,16 @@ class Session {
     plain.user_info = options.userInfo.get();
     plain.client_name = text(options.clientName);
     plain.service_name = text(options.serviceName);
+    plain.frameworks_to_check = options.frameworksToCheck.get();
     return plain;
   }
-  static std::unique_ptr<Handler> sharedHandler(const Handler& handler) {
-    return handler ? std::make_unique<Handler>(handler) : nullptr;
+  template <typename Function>
+  static std::unique_ptr<Function> sharedHandler(const Function& handler) {
+    return handler ? std::make_unique<Function>(handler) : nullptr;
+  }
+  static void onState(void* context, veltra_connection_state state, const veltra_value* backends,
+                      const char* why) {
+    (*static_cast<StateHandler*>(context))(state, backendsOf(backends), why ? why : "");
   }
   static void onAggregated(void* context, const veltra_value* sessionInfo, double timestamp,
                            std::uint16_t category, std::uint16_t type, const veltra_value* payload) {
@@ -309,6 +376,7 @@ class Session {
   }
 
   std::unique_ptr<Handler> _aggregated;
+  std::unique_ptr<StateHandler> _stateChanged;
   veltra_session* _session = nullptr;
   Error _error;
 };

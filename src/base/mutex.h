@@ -21,6 +21,7 @@
 #define EXCLUDES(...) VELTRA_ANNOTATE(locks_excluded(__VA_ARGS__))
 #define ACQUIRE(...) VELTRA_ANNOTATE(acquire_capability(__VA_ARGS__))
 #define RELEASE(...) VELTRA_ANNOTATE(release_capability(__VA_ARGS__))
+#define TRY_ACQUIRE(...) VELTRA_ANNOTATE(try_acquire_capability(__VA_ARGS__))
 #define NO_THREAD_SAFETY_ANALYSIS VELTRA_ANNOTATE(no_thread_safety_analysis)
 
 namespace veltrad {
@@ -70,6 +71,14 @@ class CAPABILITY("mutex") Mutex {
     lock_order::taking(_rank);
 #endif
     _mutex.lock();
+  }
+  // Does not wait. Takes part in the lock order like lock().
+  bool tryLock() TRY_ACQUIRE(true) {
+    const bool got = _mutex.try_lock();
+#ifndef NDEBUG
+    if (got) lock_order::taking(_rank);
+#endif
+    return got;
   }
   void unlock() RELEASE() {
     _mutex.unlock();

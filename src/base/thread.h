@@ -20,6 +20,8 @@ class Thread {
   // `body` is then destroyed. `name` is shown by debuggers and `ps`; at most 15 characters.
   bool start(const char* name, std::size_t stackBytes, std::function<void()> body);
   void join();
+  // In a forked child, in which the thread does not exist.
+  void forget() { _running = false; }
   bool running() const { return _running; }
 
  private:

@@ -44,8 +44,12 @@ Answer answerOfReply(std::string_view body) {
   const Dictionary* results = reply->dictionary(key::kResults);
   if (!results) return unreadable();
   if (const std::string* text = results->string(key::kReply)) answer->text = *text;
-  const Value* backends = results->find(key::kBackends);
-  if (backends && backends->asArray()) answer->backends = nodeOfValue(*backends);
+  if (const Value* backends = results->find(key::kBackends); backends && backends->asArray()) {
+    answer->backends = nodeOfValue(*backends);
+  }
+  if (const Value* outcomes = results->find(key::kOutcomes); outcomes && outcomes->asArray()) {
+    answer->outcomes = *outcomes;
+  }
   answer->uploaded = results->boolean(key::kUploaded).value_or(false);
   if (const Dictionary* error = results->dictionary(key::kError))
     answer->error = wire::errorOfDictionary(*error);
@@ -82,6 +86,13 @@ const veltra_value* veltra_reply_backends(const veltra_reply* reply) {
   return reply ? reply->backends.get() : nullptr;
 }
 
+const veltra_value* veltra_reply_outcomes(const veltra_reply* reply) {
+  if (!reply || !reply->outcomes) return nullptr;
+  std::call_once(reply->outcomesAsked,
+                 [reply] { reply->outcomesNode = veltrad::client::nodeOfValue(*reply->outcomes); });
+  return reply->outcomesNode.get();
+}
+
 bool veltra_reply_uploaded(const veltra_reply* reply) {
   return reply && reply->uploaded;
 }
@@ -114,8 +125,9 @@ const char* veltra_status_text(veltra_status status) {
                                            "An argument is not what it must be; nothing was done.",
                                            "The call ended without an answer.",
                                            "A waiting call inside a callback would wait for itself.",
-                                           "The call is larger than a frame may be; nothing was sent."};
-  static_assert(std::size(kTexts) == VELTRA_TOO_LARGE + 1);
+                                           "The call is larger than a frame may be; nothing was sent.",
+                                           "The session belongs to the process that forked this one."};
+  static_assert(std::size(kTexts) == VELTRA_FORKED + 1);
   const auto place = static_cast<std::size_t>(status);
   return place < std::size(kTexts) ? kTexts[place] : "Unknown status.";
 }

@@ -8,16 +8,14 @@
 
 namespace veltrad::client {
 
-std::uint32_t CallTable::freeID() const {
-  std::uint32_t callID = _lastID;
+std::uint32_t CallTable::takeID() {
   do {
-    ++callID;
-  } while (callID == 0 || _calls.contains(callID));
-  return callID;
+    ++_lastID;
+  } while (_lastID == 0 || _calls.contains(_lastID));
+  return _lastID;
 }
 
 void CallTable::add(std::uint32_t callID, Call call) {
-  _lastID = callID;
   if (!call.waiter) ++_unwaited;
   _calls.emplace(callID, std::move(call));
 }
@@ -43,12 +41,21 @@ void CallTable::addEvent(Dictionary event) {
   _ready.push_back({nullptr, nullptr, nullptr, std::move(event)});
 }
 
-void CallTable::endAll(const char* why) {
-  std::vector<std::pair<std::uint32_t, Call>> open(_calls.begin(), _calls.end());
-  _calls.clear();
-  _unwaited = 0;
-  std::sort(open.begin(), open.end(), [](const auto& a, const auto& b) { return a.first < b.first; });
-  for (const auto& [callID, call] : open) finish(call, answerOfStatus(VELTRA_NO_REPLY, why));
+void CallTable::addChange(StateChange change) {
+  _ready.push_back({nullptr, nullptr, nullptr, {}, std::make_unique<StateChange>(std::move(change))});
+}
+
+void CallTable::endAllBut(const std::unordered_set<std::uint32_t>& kept, veltra_status status,
+                          const char* why) {
+  std::vector<std::uint32_t> ended;
+  for (const auto& [callID, call] : _calls) {
+    if (!kept.contains(callID)) ended.push_back(callID);
+  }
+  // The difference orders IDs that have wrapped.
+  std::sort(ended.begin(), ended.end(), [this](std::uint32_t a, std::uint32_t b) {
+    return static_cast<std::int32_t>(a - _lastID) < static_cast<std::int32_t>(b - _lastID);
+  });
+  for (const std::uint32_t callID : ended) answer(callID, answerOfStatus(status, why));
 }
 
 void CallTable::takeReady(std::deque<Ready>& batch) {
@@ -58,12 +65,13 @@ void CallTable::takeReady(std::deque<Ready>& batch) {
 
 void CallTable::finish(const Call& call, Answer answer) {
   answer->file = call.file;
-  ++(answer->status == VELTRA_NO_REPLY ? _counts.unanswered : _counts.replies);
+  const bool came = answer->status == VELTRA_OK || answer->status == VELTRA_REFUSED;
+  ++(came ? _counts.replies : _counts.unanswered);
   if (call.waiter) {
     call.waiter->answer = std::move(answer);
     call.waiter->changed.notifyOne();
   } else {
-    _ready.push_back({call.callback, call.context, std::move(answer), {}});
+    _ready.push_back({call.callback, call.context, std::move(answer)});
   }
 }
 

@@ -5,7 +5,10 @@
 #include <cstdint>
 #include <deque>
 #include <memory>
+#include <optional>
+#include <string>
 #include <unordered_map>
+#include <unordered_set>
 
 #include "base/mutex.h"
 #include "base/value.h"
@@ -22,10 +25,19 @@ inline constexpr std::size_t kMostWaitingEvents = 4096;
 struct Waiter {
   Condition changed;
   Answer answer;
+  std::uint32_t callID = 0;
+};
+
+// See veltra_state_callback.
+struct StateChange {
+  veltra_connection_state state;
+  ValuePointer backends;
+  // Null if there is nothing to say.
+  std::optional<std::string> why;
 };
 
 // Ends each call exactly once: the answer goes to the thread that waits for it, else into the queue of
-// callbacks that the connection's thread runs. Events go into the same queue.
+// callbacks that the connection's thread runs. Events and changes of state go into the same queue.
 class CallTable {
  public:
   struct Call {
@@ -38,24 +50,26 @@ class CallTable {
 
     bool awaitsAnswer() const { return waiter || callback || file; }
   };
-  // An event if there is no answer.
+  // If there is neither an answer nor a change of state, it is an event.
   struct Ready {
     veltra_callback callback = nullptr;
     void* context = nullptr;
-    Answer answer;
-    Dictionary event;
+    Answer answer = nullptr;
+    Dictionary event = {};
+    std::unique_ptr<StateChange> change = nullptr;
   };
 
-  // Neither 0 nor the ID of an open call.
-  std::uint32_t freeID() const;
+  // Neither 0 nor the ID of an open call. Each call gives another one.
+  std::uint32_t takeID();
   void add(std::uint32_t callID, Call call);
   // Ignored if the call is not open.
   void answer(std::uint32_t callID, Answer answer);
   // The file that was lent for the call is removed once the call has its answer.
   void askForRemoval(std::uint32_t callID);
   void addEvent(Dictionary event);
-  // Ends all calls without an answer, the oldest first.
-  void endAll(const char* why);
+  void addChange(StateChange change);
+  // Ends all calls but those with these IDs without an answer, the oldest first.
+  void endAllBut(const std::unordered_set<std::uint32_t>& kept, veltra_status status, const char* why);
 
   bool anyReady() const { return !_ready.empty(); }
   // `batch` must be empty.

@@ -4,6 +4,7 @@
 
 #include "base/property_list.h"
 #include "base/text.h"
+#include "client/session_options.h"
 #include "wire/constants.h"
 #include "wire/frame.h"
 #include "wire/limits.h"
@@ -75,6 +76,16 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
   return {VELTRA_OK, std::move(frame)};
 }
 
+CallFrame counted(CallFrame call) {
+  call.counted = true;
+  return call;
+}
+
+CallFrame changing(CallFrame call, SessionChange change) {
+  if (call.status == VELTRA_OK) call.change = std::make_unique<SessionChange>(std::move(change));
+  return call;
+}
+
 // A call whose only argument is a dictionary, which is left out if it is null.
 CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary) {
   if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
@@ -89,8 +100,17 @@ CallFrame callFrame(const char* operation, Entries arguments) {
   return frameOfKind(wire::FrameKind::call, operation, std::move(arguments));
 }
 
+CallFrame startFrame() {
+  return changing(callFrame(operation::kStartConfig), {.starts = true});
+}
+
+CallFrame finishFrame() {
+  return changing(callFrame(operation::kFinishSession), {.finishes = true});
+}
+
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag) {
+  if (auto problem = problemOfFlag(flag)) return {VELTRA_INVALID, {}, nullptr, std::move(*problem)};
   if (const auto status = verdictOn(payload); status != VELTRA_OK) return {status, {}};
   Entries message;
   message.reserve(4);
@@ -98,26 +118,34 @@ CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_
   if (flag != 0) message.emplace_back(wire::kVeltraMessageParametersFlag, flag);
   if (payload) message.emplace_back(wire::kVeltraMessageParametersPayload, dictionaryOfNode(payload));
   message.emplace_back(wire::kVeltraMessageParametersType, static_cast<unsigned>(type));
-  if (flag == 0) return callFrame(operation::kSendMessage, std::move(message));
+  if (flag == 0) return counted(callFrame(operation::kSendMessage, std::move(message)));
   Entries arguments;
   arguments.emplace_back(key::kMessage, Dictionary::fromEntries(std::move(message)));
-  return callFrame(operation::kSendDictionary, std::move(arguments));
+  return counted(callFrame(operation::kSendDictionary, std::move(arguments)));
 }
 
 CallFrame messageDictionaryFrame(const veltra_value* message) {
   if (!message) return {VELTRA_INVALID, {}};
-  return dictionaryFrame(operation::kSendDictionary, key::kMessage, message);
+  return counted(dictionaryFrame(operation::kSendDictionary, key::kMessage, message));
 }
 
 CallFrame statesFrame(const veltra_value* userInfo) {
-  return dictionaryFrame(operation::kFetchStates, key::kUserInfo, userInfo);
+  SessionChange change{SessionChange::Part::userInfo};
+  CallFrame call = dictionaryFrame(operation::kFetchStates, key::kUserInfo, userInfo);
+  if (call.status == VELTRA_OK && userInfo) change.described.set(key::kUserInfo, dictionaryOfNode(userInfo));
+  return changing(std::move(call), std::move(change));
 }
 
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
   if (const auto status = verdictOn(options.user_info); status != VELTRA_OK) return {status, {}};
   Entries arguments = identity(options);
+  if (options.frameworks_to_check) {
+    if (!fits(*options.frameworks_to_check)) return {VELTRA_TOO_LARGE, {}};
+    arguments.emplace_back(key::kFrameworksToCheck, valueOfNode(*options.frameworks_to_check));
+  }
   arguments.emplace_back(key::kHasAggregationBlock, options.aggregated != nullptr);
-  return callFrame(operation::kSetSessionInfo, std::move(arguments));
+  SessionChange change{SessionChange::Part::whole, Dictionary::fromEntries(arguments)};
+  return changing(callFrame(operation::kSetSessionInfo, std::move(arguments)), std::move(change));
 }
 
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
@@ -126,10 +154,11 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
     if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
   }
   Entries arguments = identity(who);
+  SessionChange change{SessionChange::Part::sender, Dictionary::fromEntries(arguments)};
   arguments.emplace_back(key::kCategory, static_cast<unsigned>(category));
   if (payload) arguments.emplace_back(key::kPayload, dictionaryOfNode(payload));
   arguments.emplace_back(key::kType, static_cast<unsigned>(type));
-  return callFrame(operation::kSendOneShot, std::move(arguments));
+  return counted(changing(callFrame(operation::kSendOneShot, std::move(arguments)), std::move(change)));
 }
 
 CallFrame uploadFileFrame(const char* path) {
@@ -138,7 +167,7 @@ CallFrame uploadFileFrame(const char* path) {
   CallFrame call = frameOfKind(wire::FrameKind::call, operation::kUploadFile,
                                {{key::kPath, toUTF8(file->absolutePath())}}, file->descriptor() >= 0 ? 1 : 0);
   call.file = std::move(file);
-  return call;
+  return counted(std::move(call));
 }
 
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
@@ -151,8 +180,8 @@ std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
 CallFrame logDataFrame(const veltra_value* data) {
   if (!data || !data->items()) return {VELTRA_INVALID, {}};
   if (!fits(*data)) return {VELTRA_TOO_LARGE, {}};
-  return frameOfKind(wire::FrameKind::largeCall, operation::kUploadLogData,
-                     {{key::kData, valueOfNode(*data)}});
+  return counted(
+      frameOfKind(wire::FrameKind::largeCall, operation::kUploadLogData, {{key::kData, valueOfNode(*data)}}));
 }
 
 }  // namespace veltrad::client

@@ -9,6 +9,7 @@
 #include <string_view>
 
 #include "base/value.h"
+#include "client/session_standing.h"
 #include "client/uploaded_file.h"
 #include "client/value_node.h"
 #include "veltra/veltra.h"
@@ -24,10 +25,18 @@ struct CallFrame {
   std::string frame;
   // Of an upload.
   std::shared_ptr<UploadedFile> file = nullptr;
+  // What is wrong with an argument, if the status does not say enough.
+  std::string problem = {};
+  // Null if the call changes nothing.
+  std::unique_ptr<SessionChange> change = nullptr;
+  // A message, a file or log data, which is counted when it is lost.
+  bool counted = false;
 };
 
 CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});
-// `payload` is a dictionary or null. A message with a flag is sent as a message dictionary.
+CallFrame startFrame();
+CallFrame finishFrame();
+// `payload` is a dictionary or null, `flag` is 0 to 3. A message with a flag is sent as a message dictionary.
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag);
 CallFrame messageDictionaryFrame(const veltra_value* message);

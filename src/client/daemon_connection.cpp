@@ -1,336 +1,325 @@
 // SPDX-License-Identifier: Apache-2.0
-// Sends calls, receives answers and events, and runs callbacks.
+// Runs the thread of a session, and lets callers wait.
 #include "client/daemon_connection.h"
 
-#include <fmt/format.h>
 #include <poll.h>
 #include <sys/epoll.h>
-#include <sys/eventfd.h>
 #include <sys/socket.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <deque>
 #include <system_error>
-
-#include "base/property_list.h"
-#include "client/calls.h"
-#include "wire/limits.h"
 
 namespace veltrad::client {
 
 namespace {
 
 constexpr std::chrono::seconds kClosingTimeout{2};
-constexpr std::size_t kReadBytes = 16u << 10;
 // Large enough for the callbacks; only pages that were touched take memory.
 constexpr std::size_t kStackBytes = 4u << 20;
 constexpr std::uint32_t kHangUps = EPOLLRDHUP | EPOLLHUP | EPOLLERR;
-constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
 
-void setCallID(std::string& frame, std::uint32_t callID) {
-  wire::FrameHeader header = wire::decodeFrameHeader(frame.data());
-  header.callID = callID;
-  wire::encodeFrameHeader(header, frame.data());
+void waitForSocket(int socket) {
+  pollfd watched{socket, POLLIN | POLLOUT, 0};
+  ::poll(&watched, 1, -1);
 }
 
 }  // namespace
 
-std::shared_ptr<DaemonConnection> DaemonConnection::make(DaemonSocket daemon, std::size_t queueBytes,
-                                                         EventHandler handler, std::string& error) {
-  std::unique_ptr<DaemonConnection> made(
-      new DaemonConnection(std::move(daemon), queueBytes, std::move(handler)));
-  Lock lock(made->_lock);
-  made->_interest = EPOLLRDHUP | (made->_handler ? EPOLLIN : 0u);
-  epoll_event socketEvent{};
-  socketEvent.events = made->_interest;
-  socketEvent.data.fd = made->_socket.get();
-  epoll_event wakeUpEvent{};
-  wakeUpEvent.events = EPOLLIN;
-  wakeUpEvent.data.fd = made->_wakeUp.get();
-  if (!made->_epoll.isOpen() || !made->_wakeUp.isOpen() ||
-      ::epoll_ctl(made->_epoll.get(), EPOLL_CTL_ADD, made->_socket.get(), &socketEvent) != 0 ||
-      ::epoll_ctl(made->_epoll.get(), EPOLL_CTL_ADD, made->_wakeUp.get(), &wakeUpEvent) != 0) {
-    error = fmt::format("The session got no descriptors: {}; raise the limit on open files.",
-                        std::error_code(errno, std::generic_category()).message());
+std::shared_ptr<DaemonConnection> DaemonConnection::make(ConnectionOptions options,
+                                                         const std::optional<SessionChange>& description,
+                                                         std::optional<DaemonSocket> connected,
+                                                         std::string& error) {
+  std::shared_ptr<DaemonConnection> made(
+      new DaemonConnection(std::move(options), description, connected.has_value()));
+  if (!made->_watch.usable()) {
+    error = "The session got no descriptors: " + std::error_code(errno, std::generic_category()).message() +
+            "; raise the limit on open files.";
     return nullptr;
   }
-  DaemonConnection* connection = made.get();
-  if (!made->_thread.start("veltra", kStackBytes, [connection] { connection->run(); })) {
+  const bool observed = made->_options.event || made->_options.state;
+  Lock lock(made->_lock);
+  if (connected) {
+    made->_reader.restart(std::move(connected->reader), true);
+    made->_exchange.adopt(std::move(connected->socket));
+    made->_watch.watch(made->_exchange.socket(), made->wantedEvents());
+  }
+  if ((!connected || observed) && !made->startThread()) {
     error = "The session got no thread: raise the limit on tasks.";
     return nullptr;
   }
   return made;
 }
 
-DaemonConnection::DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, EventHandler handler)
-    : _socket(std::move(daemon.socket)),
-      _epoll(::epoll_create1(EPOLL_CLOEXEC)),
-      _wakeUp(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)),
-      _handler(std::move(handler)),
-      _frames(std::move(daemon.reader)),
-      _out(queueBytes) {}
+DaemonConnection::DaemonConnection(ConnectionOptions options, const std::optional<SessionChange>& description,
+                                   bool connected)
+    : _options(std::move(options)),
+      _reader(_options.path),
+      _exchange(_options, connected ? Phase::open : Phase::waiting, description) {}
 
 DaemonConnection::~DaemonConnection() {
-  if (_thread.running()) close();
+  if (!forked()) close();
+}
+
+bool DaemonConnection::startThread() {
+  return _thread.running() ||
+         (_stopping != Stopping::ending && _thread.start("veltra", kStackBytes, [this] { run(); }));
 }
 
 // ---- Calls ----
 
-veltra_status DaemonConnection::send(std::string frame, veltra_callback callback, void* context, File file) {
+veltra_status DaemonConnection::send(CallFrame call, veltra_callback callback, void* context) {
+  std::shared_ptr<UploadedFile> file = call.file;
+  const bool needsThread = callback || file;
   Lock lock(_lock);
-  return enqueue(std::move(frame), {nullptr, callback, context, std::move(file)});
+  if (!startThread() && needsThread) return _exchange.refuse(VELTRA_QUEUE_FULL);
+  const veltra_status status = _exchange.add(std::move(call), {nullptr, callback, context, std::move(file)});
+  updateWatch();
+  return status;
 }
 
-Answer DaemonConnection::sendAndWait(std::string frame, File file) {
+Answer DaemonConnection::sendAndWait(CallFrame call) {
   if (onOwnThread()) return answerOfStatus(VELTRA_WOULD_DEADLOCK);
+  const bool starts = call.change && call.change->starts;
+  std::shared_ptr<UploadedFile> file = call.file;
   Waiter waiter;
-  Lock lock(_lock);
-  const veltra_status status = enqueue(std::move(frame), {&waiter, nullptr, nullptr, std::move(file)});
-  if (status != VELTRA_OK) return answerOfStatus(status);
-  while (!waiter.answer) {
-    if (_reader == Reader::nobody) {
-      readAsWaiter(waiter);
-    } else {
-      _parked.push_back(&waiter);
-      waiter.changed.wait(_lock);
-      std::erase(_parked, &waiter);
-    }
+  const auto deadline = Clock::now() + _options.patience;
+  {
+    Lock lock(_lock);
+    if (starts) startThread();  // a started session comes back by itself
+    const veltra_status status = _exchange.add(std::move(call), {&waiter, nullptr, nullptr, std::move(file)});
+    if (status != VELTRA_OK) return answerOfStatus(status);
+    // A caller that can read at once need not have the thread watch for its answer.
+    if (_exchange.phase() != Phase::open || _role.holder() != ReaderRole::Holder::nobody) updateWatch();
   }
-  if (_reader == Reader::nobody) passOnReading();
+  for (Turn turn = waitForTurn(waiter, deadline); turn.reads; turn = waitForTurn(waiter, deadline))
+    readUntilAnswered(waiter, turn);
   return std::move(waiter.answer);
 }
 
-veltra_status DaemonConnection::enqueue(std::string frame, CallTable::Call call) {
-  if (!_out.empty()) writeWaiting();  // the thread may be inside a callback
-  const std::uint32_t callID = call.awaitsAnswer() ? _calls.freeID() : 0;
-  if (callID != 0) setCallID(frame, callID);
-  const veltra_status status = _out.write(_socket.get(), std::move(frame), call.file);
-  if (status != VELTRA_OK) return status;
-  if (callID != 0) _calls.add(callID, std::move(call));
-  updateInterest();
-  return VELTRA_OK;
-}
-
-// If the daemon has ended, answers that it sent before are still read; the end of the connection follows
-// them.
-void DaemonConnection::writeWaiting() {
-  _out.writeWaiting(_socket.get());
-  updateInterest();
-}
-
-// ---- Answers ----
-
-void DaemonConnection::waitForSocket(short events, int milliseconds) {
-  pollfd watched{_socket.get(), events, 0};
-  ::poll(&watched, 1, milliseconds);
-}
-
-DaemonConnection::Received DaemonConnection::receive(int flags) {
-  const auto [bytes, room] = _frames.room(kReadBytes);
-  const ssize_t count = ::recv(_socket.get(), bytes, room, flags);
-  if (count < 0 && (errno == EAGAIN || errno == EINTR)) return Received::nothing;
-  if (count <= 0) return Received::end;
-  _frames.received(static_cast<std::size_t>(count));
-  return takeFrames() ? Received::something : Received::end;
-}
-
-bool DaemonConnection::takeFrames() {
-  wire::Frame frame;
-  for (;;) {
-    switch (_frames.next(frame)) {
-      case wire::FrameReader::Next::needMore:
-        return true;
-      case wire::FrameReader::Next::impossible:
-        return false;
-      case wire::FrameReader::Next::frame:
-        break;
-    }
-    if (frame.header.kind == wire::FrameKind::refusal) return false;
-    if (frame.header.kind == wire::FrameKind::reply && frame.header.callID != 0) {
-      _arrived.push_back({frame.header.callID, answerOfReply(frame.body), {}});
-    } else if (frame.header.kind == wire::FrameKind::event) {
-      auto body = parseBinaryPropertyList(frame.body, wire::kDaemonFrameLimits);
-      const Dictionary* event = body ? body.value().asDictionary() : nullptr;
-      if (event) _arrived.push_back({0, nullptr, *event});
-    }
-  }
-}
-
-void DaemonConnection::readAsWaiter(const Waiter& waiter) {
-  _reader = Reader::waiter;
-  updateInterest();
+// Waits until the answer is there, or the caller is to read.
+DaemonConnection::Turn DaemonConnection::waitForTurn(Waiter& waiter, Clock::time_point deadline) {
+  Lock lock(_lock);
   while (!waiter.answer) {
-    // This call may still wait to be written, while the connection's thread is inside a callback.
-    const bool writing = !_out.empty();
-    _lock.unlock();
-    if (writing) waitForSocket(POLLIN | POLLOUT);
-    // Blocking in recv() saves the call of poll().
-    const Received received = receive(writing ? MSG_DONTWAIT : 0);
-    _lock.lock();
-    deliver();
-    if (received == Received::end) end();
-    if (writing) writeWaiting();
+    const bool open = _exchange.phase() == Phase::open;
+    if (open && _role.take(ReaderRole::Holder::waiter)) {
+      updateWatch();
+      return {true, _exchange.socket(), _exchange.writing()};
+    }
+    _role.park(waiter);
+    if (open || _exchange.phase() == Phase::starting) {
+      waiter.changed.wait(_lock);
+    } else if (!waiter.changed.waitUntil(_lock, deadline) && !waiter.answer) {
+      _exchange.withdraw(waiter);
+    }
+    _role.unpark(waiter);
   }
-  _reader = Reader::nobody;
+  // Another one that waits may be the next to read.
+  if (_role.holder() == ReaderRole::Holder::nobody) passOnReading();
+  return {false};
 }
 
-void DaemonConnection::readAsOwnThread() {
-  _reader = Reader::ownThread;
-  Received received;
-  do {
-    _lock.unlock();
-    received = receive(MSG_DONTWAIT);
-    _lock.lock();
-    deliver();
-  } while (_hungUp && received == Received::something);
-  if (_hungUp || received == Received::end) end();
-  passOnReading();
+void DaemonConnection::readUntilAnswered(const Waiter& waiter, Turn turn) {
+  while (turn.reads) {
+    // This call may still wait to be written, while the connection's thread is inside a callback.
+    if (turn.writing) waitForSocket(turn.socket);
+    // Blocking in recv() saves the call of poll().
+    const AnswerReader::Got got = _reader.receive(turn.socket, turn.writing ? MSG_DONTWAIT : 0);
+    Lock lock(_lock);
+    handle(got);
+    if (turn.writing) _exchange.writeWaiting();
+    turn = {!waiter.answer && _exchange.phase() == Phase::open, _exchange.socket(), _exchange.writing()};
+    if (!turn.reads) passOnReading();
+  }
+}
+
+// ---- Reading ----
+
+// What the role's holder has received.
+void DaemonConnection::handle(AnswerReader::Got got) {
+  const bool idle = !_exchange.calls().anyReady();
+  _exchange.take(_reader.arrived());
+  if (got == AnswerReader::Got::end || got == AnswerReader::Got::reset) {
+    _watch.forget();
+    _hungUp = false;
+    _exchange.ended(got == AnswerReader::Got::reset);
+    _role.wakeAll();  // those whose calls were not written wait for the next connection
+    if (_exchange.phase() == Phase::waiting && startThread() && !onOwnThread()) _watch.wake();
+  }
+  if (idle && _exchange.calls().anyReady() && !onOwnThread()) _watch.wake();
+  if (_stopping != Stopping::no) _progress.notifyAll();
 }
 
 void DaemonConnection::passOnReading() {
-  _reader = Reader::nobody;
-  if (_ended) return;
-  if (!_parked.empty()) {
-    _parked.front()->changed.notifyOne();
-  } else if (_hungUp) {
-    wake();
+  _role.release();
+  if (!_exchange.connected()) return;
+  if (_exchange.phase() == Phase::open && _role.wakeOne()) return;
+  if (_hungUp) {
+    _watch.wake();
   } else {
-    updateInterest();
+    updateWatch();
   }
 }
 
-void DaemonConnection::deliver() {
-  const bool idle = !_calls.anyReady();
-  for (Arrived& arrived : _arrived) {
-    if (arrived.callID != 0) {
-      _calls.answer(arrived.callID, std::move(arrived.answer));
-    } else if (const auto callID = callToRemoveFileOf(arrived.event)) {
-      _calls.askForRemoval(*callID);
-    } else if (_handler) {
-      _calls.addEvent(std::move(arrived.event));
-    }
-  }
-  _arrived.clear();
-  if (idle && _calls.anyReady() && !onOwnThread()) wake();
+// The connection's thread is not woken for answers that a waiting thread reads itself.
+std::uint32_t DaemonConnection::wantedEvents() {
+  std::uint32_t wanted = EPOLLRDHUP;
+  if (_role.holder() != ReaderRole::Holder::waiter && _exchange.expectsFrames()) wanted |= EPOLLIN;
+  if (_exchange.writing()) wanted |= EPOLLOUT;
+  return wanted;
 }
 
-// ---- The end ----
-
-void DaemonConnection::end() {
-  if (_ended) return;
-  _ended = true;
-  _out.stop();
-  unwatch();
-  _calls.endAll(kConnectionEnded);
-  if (_calls.anyReady() && !onOwnThread()) wake();
-}
-
-std::uint64_t DaemonConnection::close() {
-  using std::chrono::steady_clock;
-  const auto deadline = steady_clock::now() + kClosingTimeout;
-  {
-    Lock lock(_lock);
-    _out.close();
-    while (!_out.empty() && steady_clock::now() < deadline) {
-      const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - steady_clock::now());
-      _lock.unlock();
-      waitForSocket(POLLOUT, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
-      _lock.lock();
-      writeWaiting();
-    }
-    end();
-    ::shutdown(_socket.get(), SHUT_RDWR);  // makes a thread that reads return
-    _stopping = true;
-    wake();
-  }
-  _thread.join();
-  Lock lock(_lock);
-  return _out.lost();
-}
-
-veltra_statistics DaemonConnection::statistics() {
-  Lock lock(_lock);
-  veltra_statistics counts = _calls.counts();
-  counts.sent = _out.written();
-  counts.queued = _out.calls();
-  counts.dropped = _out.dropped();
-  return counts;
+void DaemonConnection::updateWatch() {
+  _watch.setEvents(wantedEvents());
 }
 
 // ---- The connection's thread ----
 
 void DaemonConnection::run() {
   _ownThread.store(std::this_thread::get_id(), std::memory_order_relaxed);
-  const bool open = takeFrames();
+  std::uint32_t events = EPOLLIN;  // frames may have followed the hello
+  for (;;) {
+    connectIfDue();
+    serve(events);
+    if (!runReady()) return;
+    events = _watch.wait(millisecondsToNextStep());
+  }
+}
+
+void DaemonConnection::connectIfDue() {
   {
     Lock lock(_lock);
-    deliver();
-    if (!open) end();
-    passOnReading();
+    if (_exchange.phase() != Phase::waiting || !_exchange.wish().due(Clock::now())) return;
   }
-  while (runReady()) {
-    epoll_event events[2];
-    const int count = ::epoll_wait(_epoll.get(), events, 2, -1);
-    std::uint32_t onSocket = 0;
-    for (int i = 0; i < count; ++i) {
-      if (events[i].data.fd == _socket.get()) {
-        onSocket = events[i].events;
-      } else {
-        eventfd_t wakes;
-        ::eventfd_read(_wakeUp.get(), &wakes);
-      }
-    }
-    serve(onSocket);
-  }
+  auto socket = connectAtOnce(_options.path);
+  Lock lock(_lock);
+  if (_exchange.phase() != Phase::waiting) return;
+  if (!socket) return _exchange.attemptFailed(socket.error().text);
+  _reader.restart({}, false);
+  _exchange.attempted(std::move(socket).value());
+  _watch.watch(_exchange.socket(), wantedEvents());
 }
 
 void DaemonConnection::serve(std::uint32_t events) {
-  Lock lock(_lock);
-  if (events & EPOLLOUT) writeWaiting();
-  if (events & kHangUps) {
-    _hungUp = true;
-    unwatch();  // or epoll would report it again and again while a waiting thread reads
+  const int socket = socketToRead(events);
+  for (bool goesOn = socket >= 0; goesOn;) {
+    AnswerReader::Got got = _reader.receive(socket, MSG_DONTWAIT);
+    Lock lock(_lock);
+    if (_hungUp && got == AnswerReader::Got::nothing) got = AnswerReader::Got::end;
+    handle(got);
+    goesOn = _hungUp && _exchange.connected();
+    if (!goesOn) passOnReading();
   }
-  if (((events & EPOLLIN) || _hungUp) && _reader == Reader::nobody && !_ended) readAsOwnThread();
 }
 
-// False if the thread is to end.
+// -1 if there is nothing to read, or another thread reads.
+int DaemonConnection::socketToRead(std::uint32_t events) {
+  Lock lock(_lock);
+  if (!_exchange.connected()) return -1;
+  if (_exchange.phase() == Phase::greeting && _exchange.wish().due(Clock::now())) {
+    _watch.forget();
+    _exchange.greetingFailed();
+    return -1;
+  }
+  if (events & EPOLLOUT) _exchange.writeWaiting();
+  if (events & kHangUps) {
+    _hungUp = true;
+    _watch.forget();  // or epoll would report it again and again while a waiting thread reads
+  }
+  if (((events & EPOLLIN) || _hungUp) && _role.take(ReaderRole::Holder::ownThread)) return _exchange.socket();
+  updateWatch();
+  return -1;
+}
+
+int DaemonConnection::millisecondsToNextStep() {
+  Lock lock(_lock);
+  const auto next = _exchange.wish().nextStep();
+  if (!next) return -1;
+  const auto left = std::chrono::ceil<std::chrono::milliseconds>(*next - Clock::now()).count();
+  return static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000));
+}
+
+// False if the thread is to end: the connection is closed, or a callback has forked and this is the child.
 bool DaemonConnection::runReady() {
   std::deque<CallTable::Ready> batch;
   {
     Lock lock(_lock);
-    _calls.takeReady(batch);
+    _exchange.calls().takeReady(batch);
   }
   for (CallTable::Ready& item : batch) {
-    if (!item.answer) {
-      _handler(item.event);
-      continue;
+    if (item.answer) {
+      settleUpload(*item.answer);
+      if (item.callback) item.callback(item.context, item.answer.get());
+    } else if (item.change) {
+      _options.state(*item.change);
+    } else {
+      _options.event(item.event);
     }
-    settleUpload(*item.answer);
-    if (item.callback) item.callback(item.context, item.answer.get());
+    if (forked()) return false;
   }
   Lock lock(_lock);
-  return !_stopping || _calls.anyReady();
+  return _stopping != Stopping::ending || _exchange.calls().anyReady();
 }
 
-void DaemonConnection::wake() {
-  ::eventfd_write(_wakeUp.get(), 1);
+// ---- The end ----
+
+std::uint64_t DaemonConnection::close() {
+  const auto deadline = Clock::now() + kClosingTimeout;
+  {
+    Lock lock(_lock);
+    if (_stopping == Stopping::ending) return 0;
+    _stopping = Stopping::draining;
+    _exchange.beginClosing();
+    if (!_exchange.drained() && startThread()) {
+      updateWatch();
+      _watch.wake();
+      while (!_exchange.drained() && _progress.waitUntil(_lock, deadline)) {
+      }
+    }
+    _exchange.finish();
+    _role.wakeAll();
+    _stopping = Stopping::ending;
+    _watch.wake();
+  }
+  joinThread();
+  Lock lock(_lock);
+  return _exchange.untoldLoss();
 }
 
-void DaemonConnection::unwatch() {
-  if (std::exchange(_watched, false)) ::epoll_ctl(_epoll.get(), EPOLL_CTL_DEL, _socket.get(), nullptr);
+// Nobody starts or joins it any more.
+void DaemonConnection::joinThread() {
+  _thread.join();
 }
 
-// The connection's thread is not woken for answers that a waiting thread reads itself.
-void DaemonConnection::updateInterest() {
-  if (!_watched) return;
-  std::uint32_t wanted = EPOLLRDHUP;
-  if (_reader != Reader::waiter && (_calls.unwaited() > 0 || _handler)) wanted |= EPOLLIN;
-  if (!_out.empty()) wanted |= EPOLLOUT;
-  if (std::exchange(_interest, wanted) == wanted) return;
-  epoll_event socketEvent{wanted, {}};
-  socketEvent.data.fd = _socket.get();
-  ::epoll_ctl(_epoll.get(), EPOLL_CTL_MOD, _socket.get(), &socketEvent);
+void DaemonConnection::abandon(std::shared_ptr<DaemonConnection> connection) {
+  connection->closeCopies();
+  if (!connection->mayFree()) (void)new std::shared_ptr<DaemonConnection>(std::move(connection));
+}
+
+// The child alone has this copy of the object, and one thread.
+void DaemonConnection::closeCopies() {
+  _thread.forget();
+  _watch.abandon();
+  _exchange.abandon();
+}
+
+// False if the fork came while a thread of the parent was changing the object.
+bool DaemonConnection::mayFree() {
+  if (!_lock.tryLock()) return false;
+  const bool unread = _role.holder() == ReaderRole::Holder::nobody;
+  _lock.unlock();
+  return unread;
+}
+
+veltra_statistics DaemonConnection::statistics() {
+  Lock lock(_lock);
+  return _exchange.statistics();
+}
+
+std::uint64_t DaemonConnection::counter(veltra_counter which) {
+  Lock lock(_lock);
+  return _exchange.counter(which);
 }
 
 }  // namespace veltrad::client

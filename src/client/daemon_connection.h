@@ -1,126 +1,118 @@
 // SPDX-License-Identifier: Apache-2.0
-// The client's end of a connection to the daemon. Any thread may make calls; callbacks run on its own thread.
+// A session's way to the daemon. Any thread may make calls; callbacks run on its own thread.
 #pragma once
 
 #include <atomic>
 #include <cstdint>
-#include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <thread>
-#include <vector>
 
-#include "base/file_descriptor.h"
 #include "base/mutex.h"
 #include "base/thread.h"
-#include "base/value.h"
 #include "client/answer.h"
+#include "client/answer_reader.h"
 #include "client/call_table.h"
+#include "client/calls.h"
 #include "client/daemon_socket.h"
-#include "client/out_frames.h"
+#include "client/exchange.h"
+#include "client/fork_mark.h"
+#include "client/reader_role.h"
+#include "client/socket_watch.h"
 #include "veltra/veltra.h"
-#include "wire/frame.h"
 
 namespace veltrad::client {
 
-// Sends calls to the daemon in the order in which they were made, and ends each exactly once.
+// Sends calls to the daemon in the order in which they were made, ends each exactly once, and connects again
+// when the connection has ended.
 //
-// One thread at a time reads the socket. A thread that waits for its own answer becomes the reader if there
-// is none, which makes such a call as fast as an exchange on the bare socket; otherwise the connection's
-// thread reads. The reader passes each answer to the thread that waits for it, or into the queue of
-// callbacks. Only the connection's thread runs callbacks, without holding a lock.
-//
-// Its 18 fields are the descriptors that its thread waits for and their state in epoll, the reader and what
-// it has read, the frames to be written and the open calls. They depend on each other, so one lock guards
-// them all.
+// Its thread connects, reads if no waiting thread does (ReaderRole), and runs callbacks, without a lock. It
+// is started by the first call that needs it. What is to be sent and what has come is in the Exchange; this
+// class is the threads and the lock around it.
 //
 // After close() no other call may start. Waiting threads share the ownership, because they may still use the
-// object after their answer has arrived.
+// object after their answer has arrived. In a forked child only forked() and abandon() may be called.
 class DaemonConnection {
  public:
-  // Gets an event's body on the connection's thread.
-  using EventHandler = std::function<void(const Dictionary&)>;
-
-  // Null if there are no descriptors or no thread; `error` says which. Without a handler, all events but
-  // those about uploads are dropped.
-  static std::shared_ptr<DaemonConnection> make(DaemonSocket daemon, std::size_t queueBytes,
-                                                EventHandler handler, std::string& error);
+  // `connected` is a connection on which the description was sent, or absent: then the thread connects. Null
+  // if there are no descriptors or no thread; `error` says which.
+  static std::shared_ptr<DaemonConnection> make(ConnectionOptions options,
+                                                const std::optional<SessionChange>& description,
+                                                std::optional<DaemonSocket> connected, std::string& error);
   ~DaemonConnection();
 
-  using File = std::shared_ptr<UploadedFile>;
-
-  // `frame` is a call with the call ID 0. Without a callback and a file, no answer is asked for.
-  veltra_status send(std::string frame, veltra_callback callback, void* context, File file = nullptr);
+  // In the call's frame, the call ID is 0. Without a callback and a file, the caller gets no answer.
+  veltra_status send(CallFrame call, veltra_callback callback, void* context);
   // The caller must settle the answer (settleUpload).
-  Answer sendAndWait(std::string frame, File file = nullptr);
+  Answer sendAndWait(CallFrame call);
   bool onOwnThread() const {
     return _ownThread.load(std::memory_order_relaxed) == std::this_thread::get_id();
   }
   veltra_statistics statistics();
-  // See veltra_session_close. Returns the number of calls that were accepted but never written.
+  std::uint64_t counter(veltra_counter which);
+  // See veltra_session_close. Returns the number of lost calls that no counter has told.
   std::uint64_t close();
 
- private:
-  enum class Reader { nobody, waiter, ownThread };
-  enum class Received { something, nothing, end };
+  // The process is a forked child of the one that the session belongs to.
+  bool forked() const { return _process.forked(); }
+  // In a forked child: closes its descriptors, and frees what no thread of the parent was using at the time
+  // of the fork. The connection itself is the parent's.
+  static void abandon(std::shared_ptr<DaemonConnection> connection);
 
-  // An answer or, if `callID` is 0, an event.
-  struct Arrived {
-    std::uint32_t callID = 0;
-    Answer answer;
-    Dictionary event;
+ private:
+  using Clock = Reconnection::Clock;
+  using Phase = Exchange::Phase;
+  enum class Stopping { no, draining, ending };
+  // What a waiting thread that reads does next.
+  struct Turn {
+    bool reads;
+    int socket = -1;
+    bool writing = false;
   };
 
-  DaemonConnection(DaemonSocket daemon, std::size_t queueBytes, EventHandler handler);
+  DaemonConnection(ConnectionOptions options, const std::optional<SessionChange>& description,
+                   bool connected);
 
   // Called on the connection's thread.
-  void run();
+  void run() EXCLUDES(_lock);
+  void connectIfDue() EXCLUDES(_lock);
   void serve(std::uint32_t events) EXCLUDES(_lock);
+  int socketToRead(std::uint32_t events) EXCLUDES(_lock);
+  int millisecondsToNextStep() EXCLUDES(_lock);
   bool runReady() EXCLUDES(_lock);
 
-  // Called by the reader, without the lock. takeFrames() returns false if the connection must end.
-  Received receive(int flags);
-  bool takeFrames();
-  void waitForSocket(short events, int milliseconds = -1);
+  // Called by a waiting thread.
+  Turn waitForTurn(Waiter& waiter, Clock::time_point deadline) EXCLUDES(_lock);
+  void readUntilAnswered(const Waiter& waiter, Turn turn) EXCLUDES(_lock);
 
-  veltra_status enqueue(std::string frame, CallTable::Call call) REQUIRES(_lock);
-  void readAsWaiter(const Waiter& waiter) REQUIRES(_lock);
-  void readAsOwnThread() REQUIRES(_lock);
-  void deliver() REQUIRES(_lock);
+  bool startThread() REQUIRES(_lock);
+  void handle(AnswerReader::Got got) REQUIRES(_lock);
   void passOnReading() REQUIRES(_lock);
-  void writeWaiting() REQUIRES(_lock);
-  void end() REQUIRES(_lock);
-  void updateInterest() REQUIRES(_lock);
-  void unwatch() REQUIRES(_lock);
-  void wake();
+  void updateWatch() REQUIRES(_lock);
+  std::uint32_t wantedEvents() REQUIRES(_lock);
+  void joinThread() NO_THREAD_SAFETY_ANALYSIS;
+  void closeCopies() NO_THREAD_SAFETY_ANALYSIS;
+  bool mayFree() EXCLUDES(_lock);
 
   // Constant after construction.
-  const FileDescriptor _socket;
-  FileDescriptor _epoll;
-  FileDescriptor _wakeUp;
-  const EventHandler _handler;
-  Thread _thread;
+  const ConnectionOptions _options;
+  const ForkMark _process;
   std::atomic<std::thread::id> _ownThread{};
 
-  // Used only by the reader.
-  wire::FrameReader _frames;
-  std::vector<Arrived> _arrived;
+  // Used only by whoever has the role.
+  AnswerReader _reader;
 
   Mutex _lock LEAF_LOCK{LockRank::leaf};
-  // At first the connection's thread, which handles what followed the hello.
-  Reader _reader GUARDED_BY(_lock) = Reader::ownThread;
-  // Threads that wait while another one reads.
-  std::vector<Waiter*> _parked GUARDED_BY(_lock);
-  OutFrames _out GUARDED_BY(_lock);
-  CallTable _calls GUARDED_BY(_lock);
-  // The events that epoll reports of the socket, and whether it reports any.
-  std::uint32_t _interest GUARDED_BY(_lock) = 0;
-  bool _watched GUARDED_BY(_lock) = true;
+  Condition _progress;  // of close()
+  // What the thread waits for; only waiting for it is done without the lock.
+  SocketWatch _watch;
+  Thread _thread GUARDED_BY(_lock);
+  ReaderRole _role GUARDED_BY(_lock);
+  Exchange _exchange GUARDED_BY(_lock);
   // The daemon has ended the connection; what it sent before may still be unread.
   bool _hungUp GUARDED_BY(_lock) = false;
-  bool _ended GUARDED_BY(_lock) = false;
-  // The thread ends as soon as nothing is ready.
-  bool _stopping GUARDED_BY(_lock) = false;
+  Stopping _stopping GUARDED_BY(_lock) = Stopping::no;
 };
 
 }  // namespace veltrad::client

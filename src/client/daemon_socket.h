@@ -3,6 +3,7 @@
 #pragma once
 
 #include <chrono>
+#include <optional>
 #include <string>
 
 #include "base/file_descriptor.h"
@@ -32,6 +33,17 @@ struct DaemonSocket {
 // for the daemon's hello.
 Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const std::string& firstCalls,
                                                  std::chrono::milliseconds patience = kGreetingTimeout);
+
+// Connects without waiting, for a thread that waits for other things too. The hello is the caller's to send.
+Result<FileDescriptor, ConnectFailure> connectAtOnce(const std::string& path);
+// Why this first frame of the daemon, or this refusal, is no hello that can be used; absent if it can.
+// `shown` is the socket's path as texts show it.
+std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const std::string& shown);
+// The text of a daemon that has sent no hello in time.
+ConnectFailure unansweredGreeting(const std::string& path, std::chrono::milliseconds patience);
+std::string helloFrame();
+// Why no socket can have this path; absent if one can.
+std::optional<ConnectFailure> verdictOnPath(const std::string& path);
 
 // impossible: the bytes are no frame. end: the daemon has ended the connection.
 enum class Received { frame, end, timeout, impossible };

@@ -43,35 +43,62 @@ void announceNoDescriptor(std::string& frame) {
 
 }  // namespace
 
-veltra_status OutFrames::write(int socket, std::string frame, std::shared_ptr<const UploadedFile> file) {
+void OutFrames::connect(int socket, std::string first) {
+  _socket = socket;
+  _gate = Gate::first;
+  _first = std::move(first);
+}
+
+void OutFrames::release() {
+  if (_gate == Gate::first) _gate = Gate::open;
+}
+
+void OutFrames::hold() {
+  _gate = Gate::apart;
+}
+
+void OutFrames::disconnect() {
+  _gate = Gate::apart;
+  _socket = -1;
+  _first.clear();
+  if (_taken == 0) return;
+  _record.cut(_calls.front());
+  _bytes -= _calls.front().bytes.size() - _taken;
+  _calls.pop_front();
+  _taken = 0;
+}
+
+void OutFrames::stop() {
+  disconnect();
+  _closed = true;
+  for (const OutCall& call : _calls) _record.dropped(call);
+  _calls.clear();
+  _bytes = 0;
+}
+
+veltra_status OutFrames::write(OutCall call) {
   if (_closed) return refuse(VELTRA_NO_DAEMON);
-  const bool first = _frames.empty();
-  if (!first && _bytes + frame.size() > _most) return refuse(VELTRA_QUEUE_FULL);
-  if (file && file->descriptor() < 0) file = nullptr;
-  const bool lends = file != nullptr;
-  std::size_t sent = 0;
-  if (first && !lends) {
+  const std::size_t size = call.bytes.size();
+  if (!_calls.empty() && _bytes + size > _most) return refuse(VELTRA_QUEUE_FULL);
+  if (call.file && call.file->descriptor() < 0) call.file = nullptr;
+  if (empty() && _gate == Gate::open && !call.file) {
     ssize_t count;
     do {
-      count = ::send(socket, frame.data(), frame.size(), kFlags);
+      count = ::send(_socket, call.bytes.data(), size, kFlags);
     } while (count < 0 && errno == EINTR);
-    if (count < 0 && !full(errno)) {
-      stop();
-      return refuse(VELTRA_NO_DAEMON);
-    }
-    if (count > 0) sent = static_cast<std::size_t>(count);
-    if (sent == frame.size()) {
-      ++_written;
+    if (count == static_cast<ssize_t>(size)) {
+      _record.written(call);
       return VELTRA_OK;
     }
-    _firstTaken = sent;
+    if (count < 0 && !full(errno)) hold();  // the reader will find the end of the connection
+    if (count > 0) _taken = static_cast<std::size_t>(count);
   }
-  _bytes += frame.size() - sent;
-  _frames.push_back({std::move(frame), std::move(file)});
-  if (!first || !lends || writeAll(socket)) return VELTRA_OK;
-  _frames.clear();  // counts as refused, not as lost
-  stop();
-  return refuse(VELTRA_NO_DAEMON);
+  _bytes += size - _taken;
+  const bool first = _calls.empty();
+  const bool lends = call.file != nullptr;
+  _calls.push_back(std::move(call));
+  if (first && lends) writeWaiting();
+  return VELTRA_OK;
 }
 
 veltra_status OutFrames::refuse(veltra_status why) {
@@ -79,26 +106,38 @@ veltra_status OutFrames::refuse(veltra_status why) {
   return why;
 }
 
-void OutFrames::writeWaiting(int socket) {
-  if (!writeAll(socket)) stop();
+bool OutFrames::writing() const {
+  return _gate != Gate::apart && (!_first.empty() || (_gate == Gate::open && !_calls.empty()));
 }
 
-void OutFrames::stop() {
-  _closed = true;
-  _lost += _frames.size();
-  _frames.clear();
-  _bytes = _firstTaken = 0;
+void OutFrames::writeWaiting() {
+  if (_gate == Gate::apart) return;
+  if (!writeFirst() || (_gate == Gate::open && !writeAll())) hold();
+}
+
+bool OutFrames::withdraw(std::uint32_t callID) {
+  for (auto at = _calls.begin(); at != _calls.end(); ++at) {
+    if (wire::decodeFrameHeader(at->bytes.data()).callID != callID) continue;
+    if (at == _calls.begin() && _taken > 0) return false;
+    _bytes -= at->bytes.size();
+    _calls.erase(at);
+    return true;
+  }
+  return false;
+}
+
+std::unordered_set<std::uint32_t> OutFrames::waitingIDs() const {
+  std::unordered_set<std::uint32_t> found;
+  for (const OutCall& call : _calls) found.insert(wire::decodeFrameHeader(call.bytes.data()).callID);
+  return found;
 }
 
 // False if the connection has ended.
-bool OutFrames::writeAll(int socket) {
-  while (!_frames.empty()) {
-    const ssize_t sent = send(socket);
+bool OutFrames::writeFirst() {
+  while (!_first.empty()) {
+    const ssize_t sent = ::send(_socket, _first.data(), _first.size(), kFlags);
     if (sent >= 0) {
-      taken(static_cast<std::size_t>(sent));
-    } else if (errno == ETOOMANYREFS && _frames.front().file) {  // too many descriptors are in transit
-      announceNoDescriptor(_frames.front().bytes);
-      _frames.front().file = nullptr;
+      _first.erase(0, static_cast<std::size_t>(sent));
     } else if (errno != EINTR) {
       return full(errno);
     }
@@ -106,21 +145,37 @@ bool OutFrames::writeAll(int socket) {
   return true;
 }
 
-// Sends as many frames as possible at once. A descriptor is sent with the first byte of the first frame.
-ssize_t OutFrames::send(int socket) {
+// False if the connection has ended.
+bool OutFrames::writeAll() {
+  while (_first.empty() && !_calls.empty()) {
+    const ssize_t sent = send();
+    if (sent >= 0) {
+      taken(static_cast<std::size_t>(sent));
+    } else if (errno == ETOOMANYREFS && _calls.front().file) {  // too many descriptors are in transit
+      announceNoDescriptor(_calls.front().bytes);
+      _calls.front().file = nullptr;
+    } else if (errno != EINTR) {
+      return full(errno);
+    }
+  }
+  return true;
+}
+
+// Sends as many calls as possible at once. A descriptor is sent with the first byte of the first call.
+ssize_t OutFrames::send() {
   iovec parts[kFramesAtOnce];
   std::size_t count = 0;
-  for (Waiting& frame : _frames) {
-    if (count == kFramesAtOnce || (count > 0 && frame.file)) break;
-    const std::size_t skipped = count == 0 ? _firstTaken : 0;
-    parts[count++] = {frame.bytes.data() + skipped, frame.bytes.size() - skipped};
+  for (OutCall& call : _calls) {
+    if (count == kFramesAtOnce || (count > 0 && call.file)) break;
+    const std::size_t skipped = count == 0 ? _taken : 0;
+    parts[count++] = {call.bytes.data() + skipped, call.bytes.size() - skipped};
   }
   msghdr message{};
   message.msg_iov = parts;
   message.msg_iovlen = count;
-  Waiting& first = _frames.front();
-  if (!first.file) return ::sendmsg(socket, &message, kFlags);
-  const ssize_t sent = sendWithDescriptor(socket, message, first.file->descriptor());
+  OutCall& first = _calls.front();
+  if (!first.file) return ::sendmsg(_socket, &message, kFlags);
+  const ssize_t sent = sendWithDescriptor(_socket, message, first.file->descriptor());
   if (sent > 0) first.file = nullptr;
   return sent;
 }
@@ -128,13 +183,13 @@ ssize_t OutFrames::send(int socket) {
 void OutFrames::taken(std::size_t count) {
   _bytes -= count;
   while (count > 0) {
-    const std::size_t now = std::min(count, _frames.front().bytes.size() - _firstTaken);
+    const std::size_t now = std::min(count, _calls.front().bytes.size() - _taken);
     count -= now;
-    _firstTaken += now;
-    if (_firstTaken < _frames.front().bytes.size()) return;
-    _frames.pop_front();
-    _firstTaken = 0;
-    ++_written;
+    _taken += now;
+    if (_taken < _calls.front().bytes.size()) return;
+    _record.written(_calls.front());
+    _calls.pop_front();
+    _taken = 0;
   }
 }
 

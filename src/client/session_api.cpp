@@ -6,6 +6,7 @@
 #include "client/calls.h"
 #include "client/daemon_connection.h"
 #include "client/daemon_socket.h"
+#include "client/session_options.h"
 #include "wire/names.h"
 #include "wire/socket_path.h"
 
@@ -19,6 +20,8 @@ using veltrad::Dictionary;
 
 struct veltra_session {
   std::shared_ptr<client::DaemonConnection> connection;
+  // It was made with a callback for copies.
+  bool mayAggregate;
 };
 
 namespace {
@@ -31,7 +34,7 @@ veltra_session* failed(veltra_status why, const std::string& text, veltra_status
   return nullptr;
 }
 
-client::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_callback callback,
+std::function<void(const Dictionary&)> aggregationHandler(veltra_aggregation_callback callback,
                                                           void* context) {
   if (!callback) return nullptr;
   return [callback, context](const Dictionary& event) {
@@ -49,21 +52,35 @@ client::DaemonConnection::EventHandler aggregationHandler(veltra_aggregation_cal
   };
 }
 
-veltra_status send(veltra_session* session, client::CallFrame call, veltra_callback callback, void* context) {
+std::function<void(const client::StateChange&)> stateHandler(veltra_state_callback callback, void* context) {
+  if (!callback) return nullptr;
+  return [callback, context](const client::StateChange& change) {
+    callback(context, change.state, change.backends.get(), change.why ? change.why->c_str() : nullptr);
+  };
+}
+
+// Whether calls may be made.
+veltra_status verdictOn(const veltra_session* session) {
   if (!session) return VELTRA_INVALID;
+  return session->connection->forked() ? VELTRA_FORKED : VELTRA_OK;
+}
+
+veltra_status send(veltra_session* session, client::CallFrame call, veltra_callback callback, void* context) {
+  if (const auto status = verdictOn(session); status != VELTRA_OK) return status;
   if (call.status != VELTRA_OK) return call.status;
-  return session->connection->send(std::move(call.frame), callback, context, std::move(call.file));
+  return session->connection->send(std::move(call), callback, context);
 }
 
 veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltra_reply** reply) {
-  const veltra_status status = session ? call.status : VELTRA_INVALID;
+  veltra_status status = verdictOn(session);
+  if (status == VELTRA_OK) status = call.status;
   client::Answer answer;
   if (status == VELTRA_OK) {
     const auto connection = session->connection;  // keeps it alive during a close() that ends this call
-    answer = connection->sendAndWait(std::move(call.frame), std::move(call.file));
+    answer = connection->sendAndWait(std::move(call));
     client::settleUpload(*answer);
   } else {
-    answer = client::answerOfStatus(status);
+    answer = client::answerOfStatus(status, call.problem.empty() ? nullptr : call.problem.c_str());
   }
   const veltra_status result = answer->status;
   if (reply) *reply = answer.release();
@@ -72,46 +89,64 @@ veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltr
 
 client::CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
                           const veltra_value* payload) {
-  if (!who || who->size < sizeof *who) return {VELTRA_INVALID, {}};
-  return client::oneShotFrame(*who, category, type, payload);
+  const auto options = client::completeOptions(who);
+  if (!options) return {VELTRA_INVALID, {}};
+  return client::oneShotFrame(*options, category, type, payload);
 }
 
 }  // namespace
 
-void veltra_session_options_init(veltra_session_options* options) {
-  if (!options) return;
-  *options = veltra_session_options{};
-  options->size = sizeof *options;
-}
-
-veltra_session* veltra_session_create(const veltra_session_options* options, veltra_status* status,
+veltra_session* veltra_session_create(const veltra_session_options* given, veltra_status* status,
                                       char** error) {
   if (status) *status = VELTRA_OK;
   if (error) *error = nullptr;
-  if (!options || options->size < sizeof *options) {
+  const auto options = client::completeOptions(given);
+  if (!options) {
     return failed(VELTRA_INVALID,
                   "The session's options were not set up: call veltra_session_options_init first.", status,
                   error);
   }
+  if (const auto problem = client::problemOfDescription(*options)) {
+    return failed(VELTRA_INVALID, *problem, status, error);
+  }
   const client::CallFrame description = client::sessionInfoFrame(*options);
   if (description.status != VELTRA_OK) {
     return failed(description.status,
-                  description.status == VELTRA_TOO_LARGE
-                      ? "The user info is too large: with the session info it must fit into 1,048,576 bytes."
-                      : "The user info is no dictionary.",
+                  "The user info is too large: with the session info it must fit into 1,048,576 bytes.",
                   status, error);
   }
   const std::string root =
       options->root && *options->root ? options->root : veltrad::wire::rootFromEnvironment();
-  auto reached = client::reachDaemon(veltrad::wire::socketPathUnder(root),
-                                     options->undescribed ? "" : description.frame);
-  if (!reached) return failed(reached.error().status, reached.error().text, status, error);
+  client::ConnectionOptions wanted{veltrad::wire::socketPathUnder(root),
+                                   options->connect_timeout_ms
+                                       ? std::chrono::milliseconds(options->connect_timeout_ms)
+                                       : client::kGreetingTimeout,
+                                   options->queue_bytes ? options->queue_bytes : kDefaultQueueBytes,
+                                   aggregationHandler(options->aggregated, options->aggregated_context),
+                                   stateHandler(options->state_changed, options->state_context)};
+  std::optional<client::DaemonSocket> connected;
+  if (options->connect_later) {
+    if (const auto failure = client::verdictOnPath(wanted.path))
+      return failed(failure->status, failure->text, status, error);
+  } else {
+    auto reached =
+        client::reachDaemon(wanted.path, options->undescribed ? "" : description.frame, wanted.patience);
+    if (!reached) return failed(reached.error().status, reached.error().text, status, error);
+    connected = std::move(reached).value();
+  }
   std::string text;
   auto connection = client::DaemonConnection::make(
-      std::move(reached).value(), options->queue_bytes ? options->queue_bytes : kDefaultQueueBytes,
-      aggregationHandler(options->aggregated, options->aggregated_context), text);
+      std::move(wanted), options->undescribed ? std::nullopt : std::optional(*description.change),
+      std::move(connected), text);
   if (!connection) return failed(VELTRA_NO_DAEMON, text, status, error);
-  return new veltra_session{std::move(connection)};
+  return new veltra_session{std::move(connection), options->aggregated != nullptr};
+}
+
+veltra_status veltra_session_describe(veltra_session* session, const veltra_session_options* given) {
+  const auto options = client::completeOptions(given);
+  if (!session || !options || client::problemOfDescription(*options)) return VELTRA_INVALID;
+  if (options->aggregated && !session->mayAggregate) return VELTRA_INVALID;
+  return send(session, client::sessionInfoFrame(*options), nullptr, nullptr);
 }
 
 void veltra_free(char* text) {
@@ -119,11 +154,11 @@ void veltra_free(char* text) {
 }
 
 veltra_status veltra_session_start(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(operation::kStartConfig), callback, context);
+  return send(session, client::startFrame(), callback, context);
 }
 
 veltra_status veltra_session_start_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(operation::kStartConfig), reply);
+  return sendAndWait(session, client::startFrame(), reply);
 }
 
 veltra_status veltra_session_send(veltra_session* session, uint16_t category, uint16_t type,
@@ -206,21 +241,27 @@ veltra_status veltra_session_display_url_wait(veltra_session* session, veltra_re
 }
 
 veltra_status veltra_session_finish(veltra_session* session, veltra_callback callback, void* context) {
-  return send(session, client::callFrame(operation::kFinishSession), callback, context);
+  return send(session, client::finishFrame(), callback, context);
 }
 
 veltra_status veltra_session_finish_wait(veltra_session* session, veltra_reply** reply) {
-  return sendAndWait(session, client::callFrame(operation::kFinishSession), reply);
+  return sendAndWait(session, client::finishFrame(), reply);
 }
 
 void veltra_session_statistics(veltra_session* session, veltra_statistics* statistics) {
   if (!statistics) return;
-  *statistics = session ? session->connection->statistics() : veltra_statistics{};
+  *statistics = verdictOn(session) == VELTRA_OK ? session->connection->statistics() : veltra_statistics{};
+}
+
+uint64_t veltra_session_counter(veltra_session* session, veltra_counter which) {
+  return verdictOn(session) == VELTRA_OK ? session->connection->counter(which) : 0;
 }
 
 uint64_t veltra_session_close(veltra_session* session) {
   if (!session || session->connection->onOwnThread()) return 0;
-  const uint64_t lost = session->connection->close();
+  const bool forked = session->connection->forked();
+  if (forked) client::DaemonConnection::abandon(std::move(session->connection));
+  const uint64_t lost = forked ? 0 : session->connection->close();
   delete session;
   return lost;
 }

@@ -62,9 +62,10 @@ constexpr std::array kSpoolKeys{
 constexpr KeyTable kSpoolTable{kSpoolKeys};
 
 constexpr std::array kCompressionKeys{
-    later("level", integer, {0, 9}, "6", "zlib's level for event posts; 0: plain bodies."),
+    row<&CompressionChoices::level>(
+        {"level", integer, {0, 9}, optional, "6", "zlib's level for event posts; 0: plain bodies."})
+        .key,
 };
-constexpr KeyTable kCompressionTable{kCompressionKeys};
 
 constexpr Key sampling() {
   Key key =
@@ -85,17 +86,24 @@ constexpr std::array kSettingsKeys{
     later("keys", texts, kUnbounded, "publicKey.der alone", "Files of further public keys under keys/."),
     later("fates", kFatesTable, "as its keys say", "The record of what became of messages."),
     later("spool", kSpoolTable, "no spool", "Failed posts are kept on disk and sent again."),
-    later("compression", kCompressionTable, "as its keys say", "How event posts are compressed."),
+    row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
+                                        "How event posts are compressed.", &CompressionChoices::kKeys})
+        .key,
     later("jitter", real, {0, 1}, "0", "Share by which refresh cycles and waits are spread, per device."),
 };
 
 }  // namespace
 
 constinit const KeyTable StorebagChoices::kKeys{kStorebagChoiceKeys};
+constinit const KeyTable CompressionChoices::kKeys{kCompressionKeys};
 constinit const KeyTable OperatorChoices::kKeys{kSettingsKeys};
 
 void take(const Key&, const Value& value, StorebagChoices& field) {
   if (const Dictionary* dictionary = value.asDictionary()) field = parsed<StorebagChoices>(*dictionary);
+}
+
+void take(const Key&, const Value& value, CompressionChoices& field) {
+  if (const Dictionary* dictionary = value.asDictionary()) field = parsed<CompressionChoices>(*dictionary);
 }
 
 void take(const Key&, const Value& value, Sampling& field) {

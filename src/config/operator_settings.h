@@ -3,6 +3,7 @@
 // changed.
 #pragma once
 
+#include <cstdint>
 #include <memory>
 #include <string>
 
@@ -20,6 +21,14 @@ struct StorebagChoices {
 };
 void take(const Key& key, const Value& value, StorebagChoices& field);
 
+// "compression".
+struct CompressionChoices {
+  std::int32_t level = 6;  // zlib's, for event posts; 0: plain bodies
+
+  static const KeyTable kKeys;
+};
+void take(const Key& key, const Value& value, CompressionChoices& field);
+
 // How a back end comes by its sampling factor.
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
@@ -29,6 +38,7 @@ void take(const Key& key, const Value& value, Sampling& field);
 struct OperatorChoices {
   Sampling sampling = Sampling::drawn;
   StorebagChoices storebags;
+  CompressionChoices compression;
 
   static const KeyTable kKeys;
 };

@@ -44,4 +44,10 @@ bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
   return out.sendReply(wire::makeFrame(wire::FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }
 
+void sendGoodbye(OutQueue& out, std::uint64_t calls) {
+  Dictionary body{{key::kOperation, wire::event::kGoodbye}};
+  body.set(key::kArguments, Dictionary{{key::kCalls, calls}});
+  out.sendLast(wire::makeFrame(wire::FrameKind::event, 0, std::move(body)));
+}
+
 }  // namespace veltrad::ipc

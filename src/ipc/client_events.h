@@ -23,4 +23,8 @@ std::optional<std::string> sendEvent(OutQueue& out, std::string_view frame);
 // Asks the client to remove the file that it uploads with this call. False if the client has gone.
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID);
 
+// Says that the connection ends because the daemon stops. `calls` is the number of the client's calls that
+// were run. What waits for the client still follows.
+void sendGoodbye(OutQueue& out, std::uint64_t calls);
+
 }  // namespace veltrad::ipc

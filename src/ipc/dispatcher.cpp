@@ -70,14 +70,14 @@ Refusal sendMessageWithCategory(Call& call) {
   const auto type = call.arguments.uint16(key::kType);
   if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
   call.session.sendMessageWithCategory(*category, *type, call.arguments.takeDictionary(key::kPayload),
-                                       stringReply(std::move(call.pending)));
+                                       sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithDictionary(Call& call) {
   auto message = call.arguments.takeDictionary(key::kMessage);
   if (!message) return mustBe(key::kMessage, "a dictionary");
-  call.session.sendMessageWithDictionary(std::move(*message), stringReply(std::move(call.pending)));
+  call.session.sendMessageWithDictionary(std::move(*message), sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -113,7 +113,7 @@ Refusal sendMessageWithSessionInfo(Call& call) {
   auto userInfo = call.arguments.takeDictionary(key::kUserInfo);
   call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
                                           call.arguments.takeDictionary(key::kPayload),
-                                          stringReply(std::move(call.pending)));
+                                          sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 

@@ -40,6 +40,8 @@ class OutQueue {
   // For replies, hellos and refusals, which may use the reserve. `full` also ends the connection.
   Sent sendReply(std::string_view frame);
   Sent sendEvent(std::string_view frame);
+  // For the last frame, which may use the reserve too. A client that has gone is not counted.
+  void sendLast(std::string_view frame) { put(frame, Kind::reply); }
 
   // Asks the connection's thread to end the connection after its current call.
   void requestEnd();

@@ -189,6 +189,7 @@ bool SocketConnection::runFrame(const wire::Frame& frame) {
   }
   try {
     if (!_greeted) return greet(frame);
+    ++_calls;
     if (const auto why = runCall(frame, std::move(lent))) interrupted(*why);
   } catch (const std::bad_alloc&) {
     // The destructor of the call's PendingReply has sent an error.
@@ -262,7 +263,11 @@ void SocketConnection::end() {
   if (const auto handler = std::exchange(_invalidationHandler, nullptr)) handler();
   _interruptionHandler = nullptr;
   _observer.reset();
-  if (const auto session = std::exchange(_session, nullptr)) session->end();
+  if (const auto session = std::exchange(_session, nullptr)) {
+    // Before the session's end, so that the client knows what the end of its copies means.
+    if (_greeted && _stopping.load(std::memory_order_acquire)) sendGoodbye(*_out, _calls);
+    session->end();
+  }
   writeRest();
   _out->close();
 }

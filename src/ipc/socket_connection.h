@@ -24,7 +24,7 @@ namespace veltrad::ipc {
 // call stop() and sendEvent(). Entitlements, lent files and counters must outlive it. A session and its
 // connection hold each other until run() returns.
 //
-// Its 18 fields are the services that a call needs, what the delegate has set, and the state of the
+// Its 19 fields are the services that a call needs, what the delegate has set, and the state of the
 // conversation.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
@@ -41,8 +41,8 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   void run();
   // To be called instead if the delegate has refused: tells the client why and closes the socket.
   void refuse(const std::string& description);
-  // Reads nothing more. Frames that have arrived completely are run until `deadline`; then the connection
-  // ends.
+  // Reads nothing more. Frames that have arrived completely are run until `deadline`; then the client gets
+  // the event "goodbye", and the connection ends.
   void stop(std::chrono::steady_clock::time_point deadline);
 
   // "connection 12 (uid 0, pid 345)"
@@ -100,6 +100,8 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   std::function<void()> _invalidationHandler;
   bool _resumed = false;
   bool _greeted = false;
+  // Calls that were run, or ended with an error because they could not be.
+  std::uint64_t _calls = 0;
   // The client sends nothing more.
   bool _ended = false;
   std::optional<std::chrono::steady_clock::time_point> _lackingRoomSince;

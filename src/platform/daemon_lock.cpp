@@ -5,11 +5,13 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <string_view>
 #include <system_error>
+#include <utility>
 
 namespace veltrad::platform {
 
@@ -23,17 +25,37 @@ std::string holderOf(int lock) {
   return number.empty() ? "another process" : fmt::format("process {}", number);
 }
 
-Failure<LockRefusal> outOfReach(const std::string& path) {
-  return {{false, fmt::format("{}: {}", path, std::generic_category().message(errno))}};
+Failure<LockRefusal> outOfReach(const std::string& path, int error) {
+  return {{false, fmt::format("{}: {}", path, std::generic_category().message(error))}};
+}
+
+Result<FileDescriptor, int> openLock(const std::string& path, Ownership ownership) {
+  const auto place = Place::of(path, ownership);
+  if (!place) return Failure{place.error()};
+  const int directory = place.value().directory();
+  const char* name = place.value().name();
+  constexpr int kFlags = O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+  FileDescriptor lock(::openat(directory, name, kFlags | O_EXCL, 0644));
+  if (lock.isOpen() && ownership == Ownership::inherited) {
+    const int error = place.value().giveToOwner(lock.get());
+    if (error != 0) return Failure{error};
+  }
+  if (!lock.isOpen() && errno == EEXIST) lock.reset(::openat(directory, name, kFlags, 0644));
+  struct stat status {};
+  if (!lock.isOpen() || ::fstat(lock.get(), &status) != 0) return Failure{errno};
+  // The holder's number is written into it: not into a file that has another name, too.
+  if (!S_ISREG(status.st_mode) || status.st_nlink > 1) return Failure{EMLINK};
+  return lock;
 }
 
 }  // namespace
 
-Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path) {
-  FileDescriptor lock(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
-  if (!lock.isOpen()) return outOfReach(path);
+Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path, Ownership ownership) {
+  auto opened = openLock(path, ownership);
+  if (!opened) return outOfReach(path, opened.error());
+  FileDescriptor lock = std::move(opened.value());
   if (::flock(lock.get(), LOCK_EX | LOCK_NB) != 0) {
-    if (errno != EWOULDBLOCK) return outOfReach(path);
+    if (errno != EWOULDBLOCK) return outOfReach(path, errno);
     return Failure{LockRefusal{true, fmt::format("{} holds {}", holderOf(lock.get()), path)}};
   }
   // Who holds it is for people; the lock holds without it.

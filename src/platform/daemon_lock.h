@@ -6,6 +6,7 @@
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
+#include "platform/place.h"
 
 namespace veltrad::platform {
 
@@ -15,6 +16,7 @@ struct LockRefusal {
 };
 
 // Makes the file where it is missing. Held until the descriptor is closed.
-Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path);
+Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path,
+                                                   Ownership ownership = Ownership::own);
 
 }  // namespace veltrad::platform

@@ -28,25 +28,12 @@ FileFailure failureOf(const std::string& path, int error) {
   if (error == ENOSPC || error == EDQUOT) kind = Kind::noSpace;
   if (error == EFBIG) kind = Kind::tooLarge;
   if (isShortage(error)) kind = Kind::shortage;
+  if (error == ELOOP) return {kind, path + ": too many symbolic links, or one that others may have made"};
   return {kind, path + ": " + std::generic_category().message(error)};
 }
 
 FileFailure tooLarge(const std::string& path, std::size_t most) {
   return {FileFailure::Kind::tooLarge, path + ": larger than " + std::to_string(most) + " bytes"};
-}
-
-std::string directoryOf(const std::string& path) {
-  const auto slash = path.rfind('/');
-  if (slash == std::string::npos) return ".";
-  return slash == 0 ? "/" : path.substr(0, slash);
-}
-
-// Nothing where it is so already, which needs no right.
-int give(int file, uid_t user, gid_t group) {
-  struct stat status {};
-  if (::fstat(file, &status) != 0) return errno;
-  if (status.st_uid == user && status.st_gid == group) return 0;
-  return ::fchown(file, user, group) == 0 ? 0 : errno;
 }
 
 // What a new file gets; without an owner it stays this process's.
@@ -55,37 +42,36 @@ struct Belonging {
   std::optional<std::pair<uid_t, gid_t>> owner;
 };
 
-Result<Belonging, FileFailure> inheritedFrom(const std::string& path, unsigned mode) {
+Result<Belonging, int> inheritedAt(const Place& place, unsigned mode) {
   struct stat status {};
-  if (::lstat(path.c_str(), &status) == 0 && S_ISREG(status.st_mode))
-    return Belonging{status.st_mode & 07777u, {{status.st_uid, status.st_gid}}};
-  const std::string directory = directoryOf(path);
-  if (::stat(directory.c_str(), &status) != 0) return Failure{failureOf(directory, errno)};
+  if (::fstatat(place.directory(), place.name(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+      S_ISREG(status.st_mode))
+    return Belonging{status.st_mode & 0777u, {{status.st_uid, status.st_gid}}};
+  if (::fstatat(place.directory(), ".", &status, 0) != 0) return Failure{errno};
   return Belonging{mode, {{status.st_uid, status.st_gid}}};
 }
 
 // A full disk or a quota may show at the sync or the close alone.
-int writeNewFile(const std::string& path, std::string_view bytes, const Belonging& belonging) {
-  FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+int writeNewFile(int directory, const std::string& name, std::string_view bytes, const Belonging& belonging) {
+  constexpr int kFlags = O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+  FileDescriptor file(::openat(directory, name.c_str(), kFlags, 0600));
   if (!file.isOpen()) return errno;
   int error = writeAll(file.get(), bytes);
-  if (error == 0 && belonging.owner)
-    error = give(file.get(), belonging.owner->first, belonging.owner->second);
+  if (error == 0 && belonging.owner &&
+      ::fchown(file.get(), belonging.owner->first, belonging.owner->second) != 0)
+    error = errno;
   // Exactly this mode, whatever the umask.
   if (error == 0 && ::fchmod(file.get(), belonging.mode) != 0) error = errno;
   if (error == 0 && ::fsync(file.get()) != 0) error = errno;
   if (::close(file.release()) != 0 && error == 0) error = errno;
-  if (error != 0) ::unlink(path.c_str());
+  if (error != 0) ::unlinkat(directory, name.c_str(), 0);
   return error;
 }
 
-int inheritOwner(const std::string& directory) {
-  const FileDescriptor made(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-  return made.isOpen() ? giveToOwnerOfDirectory(made.get(), directory) : errno;
-}
-
-int syncDirectory(const std::string& path) {
-  const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+int syncDirectoryOf(const Place& place) {
+  const std::string path = directoryOf(place.name());
+  const FileDescriptor directory(
+      ::openat(place.directory(), path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!directory.isOpen()) return errno;
   if (::fsync(directory.get()) == 0) return 0;
   return errno == EINVAL ? 0 : errno;  // EINVAL: the file system does not support it
@@ -113,7 +99,10 @@ bool isUnfinishedName(std::string_view name) {
 
 Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, std::size_t most) {
   // O_NONBLOCK: a pipe of this name must not block the caller.
-  const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  const auto place = Place::of(path, _ownership);
+  if (!place) return Failure{failureOf(path, place.error())};
+  const int flags = O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | place.value().links();
+  const FileDescriptor file(::openat(place.value().directory(), place.value().name(), flags));
   if (!file.isOpen()) return Failure{failureOf(path, errno)};
   struct stat status {};
   if (::fstat(file.get(), &status) != 0) return Failure{failureOf(path, errno)};
@@ -142,36 +131,54 @@ Result<std::string, FileFailure> DiskFileStore::read(const std::string& path, st
 
 Result<Done, FileFailure> DiskFileStore::replace(const std::string& path, std::string_view bytes,
                                                  unsigned mode) {
-  const std::string fresh = path + "." + randomUUIDText().substr(0, 8) + ".new";
-  auto belonging = _ownership == Ownership::own ? Belonging{mode, {}} : inheritedFrom(path, mode);
-  if (!belonging) return Failure{belonging.error()};
-  if (const int error = writeNewFile(fresh, bytes, belonging.value())) return Failure{failureOf(path, error)};
-  if (::rename(fresh.c_str(), path.c_str()) != 0) {
+  const auto place = Place::of(path, _ownership);
+  if (!place) return Failure{failureOf(path, place.error())};
+  const int directory = place.value().directory();
+  const char* name = place.value().name();
+  const std::string fresh = name + ("." + randomUUIDText().substr(0, 8)) + ".new";
+  auto belonging = _ownership == Ownership::own ? Belonging{mode, {}} : inheritedAt(place.value(), mode);
+  if (!belonging) return Failure{failureOf(path, belonging.error())};
+  if (const int error = writeNewFile(directory, fresh, bytes, belonging.value()))
+    return Failure{failureOf(path, error)};
+  if (::renameat(directory, fresh.c_str(), directory, name) != 0) {
     const int error = errno;
-    ::unlink(fresh.c_str());
+    ::unlinkat(directory, fresh.c_str(), 0);
     return Failure{failureOf(path, error)};
   }
-  if (const int error = syncDirectory(directoryOf(path))) return Failure{failureOf(directoryOf(path), error)};
+  if (const int error = syncDirectoryOf(place.value())) return Failure{failureOf(directoryOf(path), error)};
   return Done();
 }
 
 Result<Done, FileFailure> DiskFileStore::rename(const std::string& from, const std::string& to) {
-  if (::rename(from.c_str(), to.c_str()) != 0) return Failure{failureOf(from, errno)};
-  if (const int error = syncDirectory(directoryOf(to))) return Failure{failureOf(directoryOf(to), error)};
+  const auto place = Place::of(from, _ownership);
+  if (!place) return Failure{failureOf(from, place.error())};
+  const auto target = Place::of(to, _ownership);
+  if (!target) return Failure{failureOf(to, target.error())};
+  if (::renameat(place.value().directory(), place.value().name(), target.value().directory(),
+                 target.value().name()) != 0)
+    return Failure{failureOf(from, errno)};
+  if (const int error = syncDirectoryOf(target.value())) return Failure{failureOf(directoryOf(to), error)};
   return Done();
 }
 
 Result<Done, FileFailure> DiskFileStore::unlink(const std::string& path) {
-  if (::unlink(path.c_str()) != 0 && errno != ENOENT) return Failure{failureOf(path, errno)};
+  const auto place = Place::of(path, _ownership);
+  const int error = !place                                                                ? place.error()
+                    : ::unlinkat(place.value().directory(), place.value().name(), 0) != 0 ? errno
+                                                                                          : 0;
+  if (error != 0 && error != ENOENT) return Failure{failureOf(path, error)};
   return Done();
 }
 
 Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
+  const auto place = Place::of(path, _ownership);
   struct stat status {};
-  if (::stat(path.c_str(), &status) != 0) {
-    if (isShortage(errno)) return Failure{failureOf(path, errno)};
-    return FileStamp();
-  }
+  const int flags = _ownership == Ownership::own ? 0 : AT_SYMLINK_NOFOLLOW;
+  const int error = !place ? place.error()
+                    : ::fstatat(place.value().directory(), place.value().name(), &status, flags) != 0 ? errno
+                                                                                                      : 0;
+  if (isShortage(error)) return Failure{failureOf(path, error)};
+  if (error != 0) return FileStamp();
   std::uint64_t hash = 0xcbf29ce484222325u;
   for (const auto part :
        {static_cast<std::uint64_t>(status.st_dev), static_cast<std::uint64_t>(status.st_ino),
@@ -183,19 +190,14 @@ Result<FileStamp, FileFailure> DiskFileStore::stamp(const std::string& path) {
   return FileStamp(hash);
 }
 
-int giveToOwnerOfDirectory(int file, const std::string& path) {
-  struct stat status {};
-  if (::stat(directoryOf(path).c_str(), &status) != 0) return errno;
-  return give(file, status.st_uid, status.st_gid);
-}
-
 Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode, Ownership ownership) {
+  if (ownership == Ownership::inherited) {
+    const auto made = openDirectory(path, mode);
+    return made ? Result<Done, FileFailure>(Done()) : Failure{failureOf(path, made.error())};
+  }
   for (std::size_t end = path.find('/', 1);; end = path.find('/', end + 1)) {
     const std::string part = path.substr(0, end);
-    if (::mkdir(part.c_str(), mode) == 0) {
-      const int error = ownership == Ownership::inherited ? inheritOwner(part) : 0;
-      if (error != 0) return Failure{failureOf(part, error)};
-    } else if (errno != EEXIST) {
+    if (::mkdir(part.c_str(), mode) != 0 && errno != EEXIST) {
       const int error = errno;
       // An existing parent on a read-only or inaccessible file system is no error.
       struct stat status {};
@@ -212,7 +214,7 @@ Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode
 Result<Done, FileFailure> tryWritingIn(const std::string& directory) {
   if (auto made = makeDirectories(directory); !made) return made;
   const std::string path = directory + "/tried." + randomUUIDText().substr(0, 8) + ".new";
-  if (const int error = writeNewFile(path, ".", {})) return Failure{failureOf(directory, error)};
+  if (const int error = writeNewFile(AT_FDCWD, path, ".", {})) return Failure{failureOf(directory, error)};
   ::unlink(path.c_str());
   return Done();
 }

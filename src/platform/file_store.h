@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "base/result.h"
+#include "platform/place.h"
 
 namespace veltrad::platform {
 
@@ -41,11 +42,6 @@ class FileStore {
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
 };
 
-// Whose what is written is. inherited: of the owner and mode of the file that is replaced, and what is new
-// belongs to the owner of its directory: so that root leaves nothing behind that the daemon's user cannot
-// use.
-enum class Ownership { own, inherited };
-
 class DiskFileStore final : public FileStore {
  public:
   explicit DiskFileStore(Ownership ownership = Ownership::own) : _ownership(ownership) {}
@@ -63,11 +59,6 @@ class DiskFileStore final : public FileStore {
 Result<Done, FileFailure> makeDirectories(const std::string& path, unsigned mode = 0755,
                                           Ownership ownership = Ownership::own);
 
-// Gives an open file to the owner of the directory that it was made in. 0, or errno.
-int giveToOwnerOfDirectory(int file, const std::string& path);
-
-// Removes the files that killed replace() calls left in the directory: NAME.XXXXXXXX.new with eight
-// hexadecimal digits. Returns how many. To be called before anything else writes there.
 // Whether files can be made in the directory, which is made where it is missing: by making one and removing
 // it.
 Result<Done, FileFailure> tryWritingIn(const std::string& directory);

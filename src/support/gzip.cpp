@@ -52,7 +52,7 @@ const char* shown(const char* message) {
 // A deflate stream.
 class Deflation {
  public:
-  Deflation() = default;
+  explicit Deflation(int level) : level(level) {}
   ~Deflation() {
     if (_begun) deflateEnd(&stream);
   }
@@ -60,8 +60,8 @@ class Deflation {
   Deflation& operator=(const Deflation&) = delete;
 
   bool begin() {
-    const int result = deflateInit2_(&stream, Z_DEFAULT_COMPRESSION, Z_DEFLATED, kGzipWindowBits,
-                                     kMemoryLevel, Z_DEFAULT_STRATEGY, kZlibVersion, sizeof stream);
+    const int result = deflateInit2_(&stream, level, Z_DEFLATED, kGzipWindowBits, kMemoryLevel,
+                                     Z_DEFAULT_STRATEGY, kZlibVersion, sizeof stream);
     _begun = result == Z_OK;
     if (!_begun) {
       logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",
@@ -94,6 +94,7 @@ class Deflation {
              textOf(result, &FailureText::duringCompression), shown(stream.msg));
   }
 
+  const int level;
   z_stream stream{};
 
  private:
@@ -131,7 +132,7 @@ bool append(Deflation& deflation, int flush, std::string& room, const ByteSink& 
 }
 
 bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
-  Deflation deflation;
+  Deflation deflation(Z_DEFAULT_COMPRESSION);
   if (!deflation.begin()) return false;
   std::string piece(kPieceBytes, '\0'), room(kPieceBytes, '\0');
   std::size_t taken = 0;
@@ -162,14 +163,14 @@ void GzipCompressor::rest() {
   kept.swap(_kept);
 }
 
-std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes) {
+std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes, int level) {
   std::unique_ptr<Deflation> taken;
   {
     const Lock held(_mutex);
     taken.swap(_kept);
   }
-  if (!taken || !taken->beginAnew()) {
-    taken = std::make_unique<Deflation>();
+  if (!taken || taken->level != level || !taken->beginAnew()) {
+    taken = std::make_unique<Deflation>(level);
     if (!taken->begin()) return std::nullopt;
   }
   Deflation& deflation = *taken;
@@ -190,7 +191,7 @@ std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes)
   return output;
 }
 
-std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes) {
+std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes, int level) {
   if (bytes.empty()) {
     sayEmpty();
     return std::nullopt;
@@ -200,7 +201,7 @@ std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes) {
     return std::nullopt;
   }
   try {
-    return deflateAtOnce(bytes);
+    return deflateAtOnce(bytes, level);
   } catch (const std::bad_alloc&) {
     sayNoMemory();
     return std::nullopt;

@@ -23,13 +23,13 @@ class GzipCompressor {
   GzipCompressor();
   ~GzipCompressor();
 
-  // Absent if there are no bytes, memory is short or zlib fails.
-  std::optional<std::string> gzipDeflate(std::string_view bytes);
+  // `level`: zlib's, 1 (fast) to 9 (small). Absent if there are no bytes, memory is short or zlib fails.
+  std::optional<std::string> gzipDeflate(std::string_view bytes, int level);
   // Frees the stream until the next text.
   void rest();
 
  private:
-  std::optional<std::string> deflateAtOnce(std::string_view bytes);
+  std::optional<std::string> deflateAtOnce(std::string_view bytes, int level);
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::unique_ptr<Deflation> _kept GUARDED_BY(_mutex);

@@ -3,6 +3,7 @@
 #include "tools/command_line.h"
 
 #include <CLI/CLI.hpp>
+#include <memory>
 #include <tuple>
 
 namespace veltrad::tools {
@@ -40,7 +41,33 @@ Argument argumentOf(const CLI::App& app, const CLI::Option& option) {
   return argument;
 }
 
+// CLI11 would write "--port INT:INT in [0 - 65535]=8443" and "FILE TEXT REQUIRED".
+class ManualStyle : public CLI::Formatter {
+ public:
+  ManualStyle() {
+    label("SUBCOMMAND", "COMMAND");
+    label("Positionals", "Arguments");
+  }
+  std::string make_option_opts(const CLI::Option* option) const override {
+    return option->get_positional() || option->get_items_expected_max() == 0
+               ? ""
+               : " " + valueAndRange(*option).first;
+  }
+  std::string make_option_desc(const CLI::Option* option) const override {
+    const std::string range = valueAndRange(*option).second;
+    const std::string byDefault = option->get_default_str();
+    return option->get_description() + (range.empty() ? "" : " (" + range + ")") +
+           (byDefault.empty() ? "" : " [" + byDefault + "]") +
+           (option->get_required() && !option->get_positional() ? " (required)" : "");
+  }
+};
+
 }  // namespace
+
+void useManualStyle(CLI::App& app) {
+  app.formatter(std::make_shared<ManualStyle>());
+  app.set_help_flag("-h,--help", "Print this help");
+}
 
 CommandLine commandLineOf(const CLI::App& app) {
   CommandLine line{app.get_name(), app.get_description(), app.get_footer(), app.get_group(), {}, {}};

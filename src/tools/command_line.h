@@ -22,6 +22,8 @@ struct Argument {
   std::string group;
   std::string help;
   std::string byDefault;
+  // The values that there are, where completions shall offer them.
+  std::vector<std::string> choices;
   bool positional = false;
   bool required = false;
   bool repeated = false;
@@ -35,6 +37,9 @@ struct CommandLine {
   std::vector<Argument> arguments;
   std::vector<CommandLine> commands;
 };
+
+// Help shows commands, values, ranges and defaults as manual pages do. Before commands are added.
+void useManualStyle(CLI::App& app);
 
 // Without the help option of commands.
 CommandLine commandLineOf(const CLI::App& app);

@@ -44,6 +44,7 @@ inline constexpr const char* kNames[] = {
 
 // What the daemon calls.
 namespace event {
+inline constexpr const char* kGoodbye = "goodbye";
 inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";
 inline constexpr const char* kSendMessageToClient = "sendMessageToClient:timestamp:category:type:payload:";
 }  // namespace event
@@ -64,6 +65,7 @@ inline constexpr const char* kResults = "results";
 
 // Arguments.
 inline constexpr const char* kCall = "call";
+inline constexpr const char* kCalls = "calls";
 inline constexpr const char* kCategory = "category";
 inline constexpr const char* kData = "data";
 inline constexpr const char* kFrameworksToCheck = "frameworksToCheck";
@@ -78,8 +80,15 @@ inline constexpr const char* kUserInfo = "userInfo";
 
 // Results.
 inline constexpr const char* kBackends = "backends";
+inline constexpr const char* kOutcomes = "outcomes";
 inline constexpr const char* kReply = "reply";
 inline constexpr const char* kUploaded = "uploaded";
+
+// Of an outcome.
+inline constexpr const char* kBackend = "backend";
+inline constexpr const char* kOutcome = "outcome";
+inline constexpr const char* kReason = "reason";
+inline constexpr const char* kText = "text";
 }  // namespace key
 
 }  // namespace veltrad::wire

@@ -41,7 +41,7 @@ TEST(CallTable, EndsEachCallOnceAndWhereItIsAwaited) {
   calls.add(3, {nullptr, nullptr, nullptr, file});
   calls.add(kLastID - 1, {nullptr, callback, nullptr, nullptr});
   calls.add(kLastID, {&left, nullptr, nullptr, nullptr});
-  EXPECT_EQ(calls.freeID(), 4u);  // neither 0 nor one that is under way
+  EXPECT_EQ(calls.takeID(), 4u);  // neither 0 nor one that is under way
   for (std::size_t i = 0; i < client::kMostWaitingEvents + 2; ++i) calls.addEvent({});
   for (const std::uint32_t answered : {7u, 1u, 1u, 2u, 2u})
     calls.answer(answered, done(std::to_string(answered).c_str()));
@@ -59,14 +59,16 @@ TEST(CallTable, EndsEachCallOnceAndWhereItIsAwaited) {
     calls.askForRemoval(callID);
   }
   EXPECT_TRUE(file->removalAsked());
-  for (const char* why : {"gone", "gone again"}) calls.endAll(why);
+  calls.endAllBut({kLastID}, VELTRA_NO_REPLY, "gone");
+  ASSERT_FALSE(left.answer);  // it waits for the next connection
+  for (const char* why : {"gone for good", "gone again"}) calls.endAllBut({}, VELTRA_NO_REPLY, why);
   ASSERT_TRUE(left.answer);
-  EXPECT_EQ(left.answer->error->description, "gone");
+  EXPECT_EQ(left.answer->error->description, "gone for good");
   std::deque<CallTable::Ready> batch;
   calls.takeReady(batch);
   ASSERT_EQ(batch.size(), 2u);
-  EXPECT_EQ(batch[0].answer->file, file);  // the oldest first
-  EXPECT_EQ(batch[1].callback, +callback);
+  EXPECT_EQ(batch[0].callback, +callback);  // the oldest first, although IDs have wrapped
+  EXPECT_EQ(batch[1].answer->file, file);
   EXPECT_EQ(calls.counts().replies, 2u);
   EXPECT_EQ(calls.counts().unanswered, 3u);
 }

@@ -23,11 +23,14 @@ TEST(Upload, DescriptorsThatWaitTravelWithTheirFrames) {
   int ends[2];
   ASSERT_EQ(::socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
   const FileDescriptor out(ends[0]), in(ends[1]);
-  client::OutFrames frames(1u << 20);
+  client::SentRecord record;
+  client::OutFrames frames(1u << 20, record);
+  frames.connect(out.get(), {});
+  frames.release();
   std::uint32_t queued = 0;
   const auto put = [&](const std::shared_ptr<client::UploadedFile>& lent) {
     const Dictionary body{{"bulk", Data{std::string(30'000, 'b')}}};
-    frames.write(out.get(), wire::makeFrame(wire::FrameKind::call, ++queued, body, lent ? 1 : 0), lent);
+    frames.write({wire::makeFrame(wire::FrameKind::call, ++queued, body, lent ? 1 : 0), lent});
   };
   put(file("1"));  // goes at once
   while (frames.empty()) put(nullptr);
@@ -41,7 +44,7 @@ TEST(Upload, DescriptorsThatWaitTravelWithTheirFrames) {
   std::string lent;
   wire::Frame frame;
   for (std::uint32_t read = 0; read < queued;) {
-    frames.writeWaiting(out.get());
+    frames.writeWaiting();
     ASSERT_EQ(reader.receive(in.get()), ipc::SocketReader::Got::bytes);
     while (reader.next(frame) == wire::FrameReader::Next::frame) {
       EXPECT_EQ(frame.header.callID, ++read);

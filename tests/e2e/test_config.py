@@ -4,6 +4,7 @@ import fcntl
 import json
 import os
 import plistlib
+import shutil
 import stat
 import subprocess
 import unittest
@@ -108,6 +109,35 @@ class Configuration(SystemTest):
         os.chown(self.directory / "com.florn.veltra.plist", NOBODY - 1, NOBODY)
         self.ctl("config", "set", "environmentType", "1")
         self.assertEqual((self.directory / "com.florn.veltra.plist").stat().st_uid, NOBODY - 1)
+
+    @unittest.skipIf(os.getuid() != 0, "only root can be another user")
+    def test_links_of_the_daemon_user_lead_root_nowhere(self):
+        """Each row: what stands under which name, and whether root made it, who may."""
+        state, elsewhere = self.root.path / "var/lib/veltrad", self.root.path / "elsewhere"
+        elsewhere.mkdir()
+        secret = elsewhere / "com.florn.veltra.plist"
+        secret.write_bytes(plistlib.dumps({"secret": "word"}))
+        rows = ((self.directory, elsewhere, os.symlink, False), (self.directory, elsewhere, os.symlink, True),
+                (self.directory / secret.name, secret, os.symlink, False),
+                (self.root.path / "run/veltrad", elsewhere, os.symlink, False),
+                (self.root.path / "run/veltrad/lock", secret, os.link, False))
+        for path, target, link, ours in rows:
+            with self.subTest(path=path, ours=ours):
+                os.makedirs(path.parent, exist_ok=True)
+                shutil.rmtree(path) if path.is_dir() else path.unlink(missing_ok=True)
+                before = {file.name: file.read_bytes() for file in elsewhere.iterdir()}
+                link(target, path)
+                owned = state if state in path.parents else self.root.path / "run"
+                os.chown(owned, *(0, 0) if ours else (NOBODY, NOBODY))
+                os.chown(path.parent, *(0, 0) if ours else (NOBODY, NOBODY))
+                words = self.ctl("config", "set", "environmentType", "1", status=0 if ours else 1)
+                after = {file.name: file.read_bytes() for file in elsewhere.iterdir()}
+                if ours:
+                    self.assertEqual(plistlib.loads(secret.read_bytes()), {"secret": "word", "environmentType": 1})
+                else:
+                    self.assertIn("link", words[1])
+                    self.assertEqual(after, before)
+                path.unlink()
 
     @unittest.skipIf(os.getuid() != 0, "only root can be another user")
     def test_who_may(self):

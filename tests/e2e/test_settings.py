@@ -92,6 +92,26 @@ class Sampling(SystemTest):
         self.assertNotEqual(lasting, first)
 
 
+class Compression(SystemTest):
+    def test_posts_are_compressed_at_the_level_that_is_written_now(self):
+        text, posts = " ".join(f"line {n} of {n // 7} at {n * n % 101}" for n in range(400)), []
+        with self.serving("last ones stand") as daemon:
+            session, _ = self.open()
+            for number, level in enumerate(("none", 1, 9, 0, 10)):  # 10 is refused, and 0 stands
+                if level != "none":
+                    self.root.write(SETTINGS, comments('{"compression": {"level": %d}}' % level))
+                session.send(number=number, text=text)
+                self.lab.wait_for_events(1, number=number)
+                posts.append(next(post for post in self.lab.received("events")
+                                  if post["body"]["events"][0].get("number") == number))
+            daemon.wait_for_line('2:18: "level" is 10: expected an integer from 0 to 9')
+            session.close()
+        default, fast, small, plain, still_plain = (post["bytes"] for post in posts)
+        self.assertTrue(small <= default + 16 and default + 200 < fast < plain / 2, (small, default, fast, plain))
+        self.assertTrue(len(text) < min(plain, still_plain))
+        self.assertEqual([post["headers"].get("Content-Encoding") for post in posts], ["gzip"] * 3 + [None] * 2)
+
+
 class Persistence(SystemTest):
     def cut_off(self):
         self.root.prefer(veltra_storebag_url=f"https://localhost:{closed_port()}/bags")

@@ -7,6 +7,7 @@
 #include "backends/backend_factory.h"
 #include "backends/dashboard/work_pool.h"
 #include "backends/mivo/code_bundle.h"
+#include "config/operator_settings.h"
 #include "config/process_settings.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
@@ -19,7 +20,7 @@
 
 namespace veltrad {
 
-// Its 18 fields are the services in the order in which they need each other.
+// Its 19 fields are the services in the order in which they need each other.
 struct World {
   FakeHTTPClient http;
   FakeClock clock;
@@ -36,10 +37,11 @@ struct World {
   platform::Root root{"/"};
   support::DeviceIdentity device{properties};
   config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
+  config::OperatorSettings choices{files, root.settingsPath()};
   support::Veltra library{files, preferences, root};
   const backends::BackendServices services{http,     clock,     random,        locale,   preferences,
-                                           counters, energyLog, adaptorBundle, settings, device,
-                                           library,  pool,      lentFiles};
+                                           counters, energyLog, adaptorBundle, settings, choices,
+                                           device,   library,   pool,          lentFiles};
   backends::BackendFactory factory{services};
 };
 

@@ -54,6 +54,9 @@ TEST(Vectors, OfTheDocumentAreWhatTheCodeWrites) {
       {"remove-event", wire::makeFrame(wire::FrameKind::event, 0,
                                        {{"op", wire::event::kRemoveUploadedFile},
                                         {"args", Dictionary{{"call", 0x01020304}}}})},
+      {"goodbye-event",
+       wire::makeFrame(wire::FrameKind::event, 0,
+                       {{"op", wire::event::kGoodbye}, {"args", Dictionary{{"calls", 3u}}}})},
       {"refusal", wire::makeFrame(wire::FrameKind::refusal, 0,
                                   error("The client speaks wire version 2, the daemon speaks version 1."))},
   };

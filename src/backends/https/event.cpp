@@ -67,7 +67,7 @@ Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::stri
   const double clientTS =
       finiteOrMinusOne(startTS + (platform::timevalToSeconds(message.timestamp) - facts.startTimeStamp));
 
-  const std::size_t userFields = facts.userInfo ? facts.userInfo->size() : 0;
+  const std::size_t userFields = facts.sentUserInfo ? facts.sentUserInfo->size() : 0;
   FieldMerge event(message.payload ? std::move(*message.payload) : Dictionary(), kFixedFields + userFields);
   if (device.buildVersion) event.add("_build", *device.buildVersion);
   event.add("_clientTS", clientTS);

@@ -14,13 +14,18 @@
 #include "http/http_client.h"
 #include "platform/limited_line.h"
 
+namespace veltrad::config {
+class OperatorSettings;
+}  // namespace veltrad::config
+
 namespace veltrad::backends {
 
 // One object serves all HTTPS post back ends. It outlives them and their posts.
 class EventPosts {
  public:
-  EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters)
-      : _http(http), _clock(clock), _counters(counters) {}
+  EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters,
+             config::OperatorSettings& choices)
+      : _http(http), _clock(clock), _counters(counters), _choices(choices) {}
 
   struct Post {
     std::string json;
@@ -37,24 +42,28 @@ class EventPosts {
   // The events have been restricted. `expectedBytes` as for writeJSON.
   JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
                                              bool wantPretty, std::size_t expectedBytes) const;
-  // The post keeps the back end alive. A status of 5xx disables the back end.
-  void postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
-                       const std::optional<std::string>& url, Post post);
-  // Counts the events as lost and calls `completion`, if there is one.
-  void refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                  const VeltraBackend::FlushCompletion& completion);
+  // The post keeps the back end alive. A status of 5xx disables the back end. Returns why the post has not
+  // begun, if it has not.
+  std::optional<wire::Reason> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                              const SessionFacts& facts,
+                                              const std::optional<std::string>& url, Post post);
+  // Counts the events as lost, under the reason that it returns, and calls `completion`, if there is one.
+  wire::Reason refusePost(VeltraBackend& backEnd, std::size_t eventCount,
+                          const VeltraBackend::FlushCompletion& completion);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
   // Frees what is kept from post to post.
   void rest() { _gzip.rest(); }
 
  private:
+  int compressionLevel();
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
                                                    const std::string& url, std::size_t eventCount);
 
   http::HTTPClient& _http;
   const platform::Clock& _clock;
   platform::Counters& _counters;
+  config::OperatorSettings& _choices;
 
   // Shared, so that many sessions log no more lines than one.
   platform::LimitedLine _errorLine{"posts"};

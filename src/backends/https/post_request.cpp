@@ -16,20 +16,21 @@ std::string orNull(const std::optional<std::string>& text) {
 }  // namespace
 
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
-                                  std::optional<EventMap> eventMap, support::GzipCompressor& gzip) {
+                                  std::optional<EventMap> eventMap, BodyCompression compression) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::event;
   request.url = std::move(url);
   request.keepsAnswer = false;
 
-  auto compressed = gzip.gzipDeflate(json);
+  std::optional<std::string> compressed;
+  if (compression.level > 0) compressed = compression.gzip.gzipDeflate(json, compression.level);
   const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
   request.body.shrink_to_fit();  // it may wait for a server for a long time
 
   auto& headers = request.headers;
-  if (const SharedDictionary& userInfo = facts.userInfo) {
+  if (const SharedDictionary& userInfo = facts.sentUserInfo) {
     if (const std::string* name = userInfo->string(wire::kVeltraUserInfoClientName)) {
       headers.emplace_back("X-VLT-Client-Name", *name);
     }

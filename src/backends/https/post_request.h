@@ -20,9 +20,15 @@ struct EventMap {
   std::uint16_t responseCode;
 };
 
+// How a body is compressed: `level` is zlib's, 0 to 9, and 0 leaves it plain.
+struct BodyCompression {
+  support::GzipCompressor& gzip;
+  int level;
+};
+
 // Compresses the JSON text if that makes it shorter. In "User-Agent", "(null)" stands for an absent text.
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
-                                  std::optional<EventMap> eventMap, support::GzipCompressor& gzip);
+                                  std::optional<EventMap> eventMap, BodyCompression compression);
 
 // What an answer's status means for the back end and for the posted events.
 struct PostVerdict {

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "base/text.h"
+#include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
 #include "tools/ctl/key_value.h"
 #include "veltra/veltra.h"
@@ -39,6 +40,11 @@ std::string keyValueProblem(const std::string& text) {
 
 std::string textProblem(const std::string& text) {
   return isUTF8(text) ? std::string() : fmt::format("\"{}\": expected UTF-8", escapedForLog(text));
+}
+
+std::string flagProblem(const std::string& text) {
+  if (text.size() == 1 && text[0] >= '0' && text[0] <= '3') return {};
+  return fmt::format("expected an integer from 0 to 3, found \"{}\"", escapedForLog(text));
 }
 
 // A decimal number in the range of T.
@@ -155,8 +161,21 @@ void addSend(CLI::App& app, Options& options, Texts& texts) {
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
   addMessage(*send, options, texts);
   addNumber<std::uint32_t>(*send, "--flag", options.flag,
-                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither");
-  send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
+                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither")
+      ->check(CLI::Validator(flagProblem, ""));
+  send->add_option_function<std::string>(
+          "--expect", [&options](const std::string&) { options.expectReported = true; },
+          "reported: exit with status 1 unless a back end reports the message")
+      ->type_name("WHAT")
+      ->check(CLI::Validator(
+          [](const std::string& text) {
+            return text == "reported" ? std::string()
+                                      : fmt::format("expected reported, found \"{}\"", escapedForLog(text));
+          },
+          ""));
+  send->footer(
+      "Says on standard error what each back end has done with the message, and why.\n\n"
+      "Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
 
 void addOneShot(CLI::App& app, Options& options, Texts& texts) {
@@ -245,6 +264,15 @@ Ending endingOf(const CLI::App& app, const CLI::ParseError& error) {
   return Ending{0, output.str(), ""};
 }
 
+// To complete KEY of `config get KEY` and its like.
+void offerPreferences(tools::CommandLine& line) {
+  for (tools::Argument& argument : line.arguments) {
+    if (argument.names[0] != "KEY") continue;
+    for (const config::PreferenceKey& key : config::preferenceKeys()) argument.choices.push_back(key.name());
+  }
+  for (tools::CommandLine& command : line.commands) offerPreferences(command);
+}
+
 // The texts have been checked.
 void putTogether(const Texts& texts, Options& options) {
   if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
@@ -288,7 +316,9 @@ tools::CommandLine commandLine() {
   Texts texts;
   CLI::App app;
   describe(app, options, texts);
-  return tools::commandLineOf(app);
+  tools::CommandLine line = tools::commandLineOf(app);
+  offerPreferences(line);
+  return line;
 }
 
 }  // namespace veltrad::ctl

@@ -42,14 +42,13 @@ bool isMissing(const std::string& path) {
 // `why`: of the control socket that did not answer.
 Result<FileDescriptor, std::string> takeLock(const platform::Root& root, const std::string& why) {
   const std::string path = root.lockPath();
-  const bool isNew = isMissing(path);
   if (const auto made = platform::makeDirectories(root.runDirectory(), 0755, Ownership::inherited); !made) {
     return Failure{
         fmt::format("No daemon answers, and none can be kept from starting: {}. Run veltractl as "
                     "root or as the user that runs veltrad.",
                     made.error().description)};
   }
-  auto lock = platform::takeDaemonLock(path);
+  auto lock = platform::takeDaemonLock(path, Ownership::inherited);
   if (!lock && lock.error().held)
     return Failure{fmt::format("A daemon runs, but does not answer ({}): {}", lock.error().description, why)};
   if (!lock) {
@@ -58,8 +57,6 @@ Result<FileDescriptor, std::string> takeLock(const platform::Root& root, const s
         "that runs veltrad.",
         lock.error().description)};
   }
-  if (isNew && platform::giveToOwnerOfDirectory(lock.value().get(), path) != 0)
-    return Failure{fmt::format("{} cannot be given to the owner of its directory.", path)};
   return std::move(lock.value());
 }
 

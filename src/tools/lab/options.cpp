@@ -33,11 +33,20 @@ drop, duplicate, reorder (send it after the next one), short, long, foreign (ano
 (from another port):
   {"path": "/dashboard", "share": 30, "ack": "drop"})";
 
+constexpr const char* kExamples =
+    R"(Examples:
+  veltra-lab --dir /tmp/lab                               the storebag is /tmp/lab/storebags/quindle.json
+  veltra-lab --misbehave '{"path": "/events", "status": 503, "times": 3}'
+  curl --cacert /tmp/lab/certificate.pem 'https://localhost:8443/received?kind=events'
+  curl --cacert /tmp/lab/certificate.pem --data '{"path": "/events", "delayMs": 500}' https://localhost:8443/control)";
+
 }  // namespace
 
 void describe(CLI::App& app, Options& options) {
   app.name("veltra-lab");
   app.description(kAbout);
+  tools::useManualStyle(app);
+  app.footer(kExamples);
   app.set_version_flag("--version", std::string("veltra-lab ") + kVersion, "Print the version");
   app.add_option("--dir", options.path, "Directory for the certificate, keys, storebags and received data")
       ->type_name("DIR")
@@ -51,8 +60,7 @@ void describe(CLI::App& app, Options& options) {
   app.add_option("--max-age", options.maxAge, "Seconds for which storebags stay fresh")
       ->check(CLI::Range(0, 2'147'483'647))
       ->capture_default_str();
-  app.add_option("--misbehave", options.rules,
-                 "A rule as JSON, for instance '{\"path\": \"/events\", \"status\": 503}'")
+  app.add_option("--misbehave", options.rules, "A rule as JSON; repeat the option for more")
       ->type_name("RULE");
 }
 

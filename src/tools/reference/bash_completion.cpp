@@ -18,6 +18,7 @@ struct Cases {
   std::string descents;                                   // from a path and a word to the next path
   std::string words;                                      // by path
   std::string arguments;                                  // whether a command takes files, by path
+  std::string choices;                                    // what its first argument may be, by path
   std::vector<std::string> files, directories, anything;  // options by what follows them
 };
 
@@ -32,6 +33,8 @@ void collect(const CommandLine& line, const std::string& path, Cases& cases) {
   for (const Argument& argument : line.arguments) {
     if (argument.positional) {
       file = file || argument.names[0] == "FILE";
+      if (!argument.choices.empty())
+        cases.choices += fmt::format("    {}+0) words=\"{}\" ;;\n", path, fmt::join(argument.choices, " "));
       continue;
     }
     for (const std::string& name : argument.names) words += " " + name;
@@ -55,13 +58,15 @@ std::string pattern(const std::vector<std::string>& names) {
 constexpr const char* kFile =
     R"(# bash completion for {0}. Made from the program's own command line; do not change it by hand.
 _{0}() {{
-  local current=${{COMP_WORDS[COMP_CWORD]}} previous=${{COMP_WORDS[COMP_CWORD - 1]}} path="" words="" i
+  local current=${{COMP_WORDS[COMP_CWORD]}} previous=${{COMP_WORDS[COMP_CWORD - 1]}} path="" words="" given=0 i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${{COMP_WORDS[i]}} in
       {1}) ((i++)) ; continue ;;
     esac
     case $path+${{COMP_WORDS[i]}} in
       {2}) path+=/${{COMP_WORDS[i]}} ;;
+      *+-*) ;;
+      *) ((given++)) ;;
     esac
   done
   COMPREPLY=()
@@ -74,6 +79,8 @@ _{0}() {{
 {5}  esac
   [[ $path == "" ]] || words+="{6}"
   if [[ $current != -* ]]; then
+    case $path+$given in
+{8}    esac
     case $path in
       {7}) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
     esac
@@ -93,7 +100,7 @@ std::string bashCompletion(const CommandLine& program) {
     for (const std::string& name : argument.names)
       if (!argument.positional) everywhere += " " + name;
   return fmt::format(kFile, program.name, pattern(cases.anything), cases.descents, pattern(cases.files),
-                     pattern(cases.directories), cases.words, everywhere, cases.arguments);
+                     pattern(cases.directories), cases.words, everywhere, cases.arguments, cases.choices);
 }
 
 }  // namespace veltrad::reference

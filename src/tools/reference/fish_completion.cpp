@@ -32,6 +32,14 @@ std::string optionLine(const std::string& start, const Argument& argument) {
   return start + names + kindOf(argument.value) + " -d " + quoted(argument.help) + "\n";
 }
 
+// Offered until one of them has been typed.
+std::string choicesLine(const std::string& complete, const std::string& condition, const Argument& argument) {
+  const std::string choices = fmt::format("{}", fmt::join(argument.choices, " "));
+  const std::string until = condition + "; and not __fish_seen_subcommand_from " + choices;
+  return fmt::format("{} -n {} -a {} -d {}\n", complete, quoted(until), quoted(choices),
+                     quoted(argument.help));
+}
+
 // `condition` holds once the command has been typed.
 std::string linesOf(const CommandLine& line, const std::string& complete, const std::string& condition) {
   std::string lines;
@@ -41,6 +49,8 @@ std::string linesOf(const CommandLine& line, const std::string& complete, const 
       lines += optionLine(start, argument);
     else if (argument.names[0] == "FILE")
       lines += start + " -F\n";
+    else if (!argument.choices.empty())
+      lines += choicesLine(complete, condition, argument);
   }
   std::string names;
   for (const CommandLine& command : line.commands) names += " " + command.name;

@@ -24,7 +24,8 @@ std::string quoted(std::string_view text, std::string_view special) {
   return result;
 }
 
-std::string action(const std::string& value) {
+std::string action(const std::string& value, const Argument& argument) {
+  if (!argument.choices.empty()) return fmt::format("({})", fmt::join(argument.choices, " "));
   if (value == "FILE") return "_files";
   if (value == "DIR") return "_directories";
   return " ";
@@ -34,12 +35,12 @@ std::string specOf(const Argument& argument) {
   const std::string value = argument.positional ? argument.names[0] : argument.value;
   if (argument.positional) {
     const char* form = argument.repeated ? "    '*:{}:{}' \\\n" : "    ':{}:{}' \\\n";
-    return fmt::format(fmt::runtime(form), quoted(value, ":"), action(value));
+    return fmt::format(fmt::runtime(form), quoted(value, ":"), action(value, argument));
   }
   std::string specs;
   for (const std::string& name : argument.names) {
     specs += fmt::format("    '{}{}[{}]", argument.repeated ? "*" : "", name, quoted(argument.help, "[]:\\"));
-    if (!value.empty()) specs += fmt::format(":{}:{}", quoted(value, ":"), action(value));
+    if (!value.empty()) specs += fmt::format(":{}:{}", quoted(value, ":"), action(value, argument));
     specs += "' \\\n";
   }
   return specs;

@@ -70,10 +70,16 @@ std::string offered(const std::string& words) {
 
 TEST(Completions, OfBash) {
   const std::pair<const char*, const char*> cases[] = {
-      {"veltractl sta", "states status stats\n"}, {"veltractl --root send sta", "states status stats\n"},
-      {"veltractl send --cat", "--category\n"},   {"veltractl status --js", "--json\n"},
-      {"veltractl send --type \"\"", "\n"},       {"veltractl upload READ", "README.md\n"},
-      {"veltractl --root exam", "examples\n"}};
+      {"veltractl sta", "states status stats\n"},
+      {"veltractl --root send sta", "states status stats\n"},
+      {"veltractl send --cat", "--category\n"},
+      {"veltractl status --js", "--json\n"},
+      {"veltractl send --type \"\"", "\n"},
+      {"veltractl upload READ", "README.md\n"},
+      {"veltractl --root exam", "examples\n"},
+      {"veltractl config get env", "environmentType\n"},
+      {"veltractl config unset --json com.", "com.florn.timed/TMAutomaticTimeZoneEnabled\n"},
+      {"veltractl config set environmentType env", "\n"}};
   for (const auto& [words, expected] : cases) EXPECT_EQ(offered(words), expected) << words;
 }
 

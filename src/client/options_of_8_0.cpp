@@ -1,0 +1,16 @@
+// SPDX-License-Identifier: Apache-2.0
+// What libveltra exports to programs that were built with 8.0. Not in the room: only a shared object has
+// versions of a symbol.
+#include <cstring>
+
+#include "client/session_options.h"
+
+// Their struct of options is smaller than today's.
+extern "C" void options_init_of_8_0(veltra_session_options* options);
+__asm__(".symver options_init_of_8_0, veltra_session_options_init@VELTRA_8");
+
+void options_init_of_8_0(veltra_session_options* options) {
+  if (!options) return;
+  std::memset(static_cast<void*>(options), 0, veltrad::client::kSizeOf80);
+  options->size = veltrad::client::kSizeOf80;
+}
