@@ -227,37 +227,32 @@ void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
                                                                    wire::Outcomes* outcomes, Origin origin) {
-  hearOwner();
   if (!hasBackends(origin)) return std::nullopt;
   return sendMessage({std::move(payload), {}, category, type, 0}, outcomes);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary message,
                                                                      wire::Outcomes* outcomes) {
-  hearOwner();
   if (!hasBackends(Origin::client)) return std::nullopt;
-  const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
+  const auto category = message.uint16(wire::kVeltraMessageParametersCategory);
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
     _services.counters.count(wire::Reason::no_category);
     return std::nullopt;
   }
-  const auto type = message.uint32(wire::kVeltraMessageParametersType);
+  const auto type = message.uint16(wire::kVeltraMessageParametersType);
   if (!type) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
     _services.counters.count(wire::Reason::no_type);
     return std::nullopt;
   }
-  const auto flag = message.uint32(wire::kVeltraMessageParametersFlag).value_or(0);
-  return sendMessage({message.takeDictionary(wire::kVeltraMessageParametersPayload),
-                      {},
-                      static_cast<std::uint16_t>(*category),
-                      static_cast<std::uint16_t>(*type),
-                      static_cast<std::int32_t>(flag)},
-                     outcomes);
+  const std::int32_t flag = message.int32(wire::kVeltraMessageParametersFlag).value_or(0);
+  auto payload = message.takeDictionary(wire::kVeltraMessageParametersPayload);
+  return sendMessage({std::move(payload), {}, *category, *type, flag}, outcomes);
 }
 
-bool VeltradSession::hasBackends(Origin origin) const {
+bool VeltradSession::hasBackends(Origin origin) {
+  hearOwner();
   if (_backends) return true;
   logDebug("sendMessageWithDictionary: No backends available to send message");
   if (origin == Origin::client) _services.counters.count(wire::Reason::no_backends);

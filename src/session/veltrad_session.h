@@ -93,7 +93,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void keepUserInfo(backends::SharedDictionary info);
   // Messages of the session itself are not counted as lost.
   enum class Origin { client, session };
-  bool hasBackends(Origin origin) const;
+  // Hears the owner's word first.
+  bool hasBackends(Origin origin);
   // These check the message and return the answer for the client. `outcomes` is null if nobody waits for
   // them.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
