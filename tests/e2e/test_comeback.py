@@ -3,10 +3,12 @@
 counted."""
 import collections
 import json
+import os
 import signal
+import socket
 import subprocess
 
-from harness import Process, SystemTest, program, storebag
+from harness import Process, SystemTest, activated, program, storebag
 
 
 BATCH = 49  # messages of a session that a daemon holds at most
@@ -42,8 +44,10 @@ class Comeback(SystemTest):
         super().setUp()
         self.lab.put("quindle", storebag())
 
+    handed, by_daemons = {}, 0
+
     def daemon(self):
-        return super().daemon(env={"VELTRA_LOG": "info"})
+        return super().daemon(env={"VELTRA_LOG": "info"}, **self.handed)
 
     def sender(self, name, microseconds=8000, kind="post"):
         sender = Sender(self.root, name, microseconds, kind)
@@ -58,31 +62,58 @@ class Comeback(SystemTest):
         for sender in senders:
             self.lab.wait_for_events(before.get(sender.name, 0) + 1, sender=sender.name)
 
+    def stop(self, daemon):
+        daemon.allow("post error", "did not end within")  # on a busy machine, whose last posts come too late
+        daemon.stop()
+        lost = ("message lost", "message dropped", "event lost", "event dropped")
+        self.by_daemons += sum(count for key, count in self.counts().items() if key.startswith(lost))
+
     def check(self, said, held=0):
-        """Compares what has arrived with what the senders say. `held`: messages that daemons had taken in and not posted when
-        they were killed, which are not the library's to count."""
-        counts = arrived(self.lab)
+        """Compares what has arrived with what the senders and the daemons say. `held`: messages that daemons had taken in and
+        not posted when they were killed, which are not the library's to count."""
+        counts, counted = arrived(self.lab), self.by_daemons
         for one in said:
             numbers = counts[one["sender"]]
             with self.subTest(one):
                 self.assertEqual(max(numbers.values(), default=1), 1, "a message arrived twice")
-                counted = len(numbers) + one["lost"] + one["closed"]
-                if held:
-                    self.assertGreaterEqual(counted + held, one["sent"])
-                else:
-                    self.assertEqual(counted, one["sent"])
+                here = len(numbers) + one["lost"] + one["closed"]
+                counted += here
+                if not held:
+                    self.assertLessEqual(here, one["sent"])
+        sent = sum(one["sent"] for one in said)
+        if held:
+            self.assertGreaterEqual(counted + held, sent)
+        else:
+            self.assertEqual(counted, sent, said)
 
     def test_orderly_restarts_lose_nothing_in_silence(self):
         senders = [self.sender("early")]  # before there is a daemon
         self.running = self.daemon()
         senders += [self.sender("post"), self.sender("reply", kind="reply")]
         for _ in range(4):
-            self.restart(senders, lambda daemon: daemon.stop())
+            self.restart(senders, self.stop)
         said = [sender.finish() for sender in senders]
-        self.running.stop()
+        self.stop(self.running)
         self.check(said)
         for one in said:
             self.assertGreater(one["connections"], 1)
+
+    def test_a_service_manager_that_keeps_the_socket_open(self):
+        os.makedirs(os.path.dirname(self.root.socket))
+        with socket.socket(socket.AF_UNIX) as listener, socket.socket(socket.AF_UNIX) as control:
+            listener.bind(self.root.socket)
+            control.bind(os.path.dirname(self.root.socket) + "/control.sock")
+            for one in (listener, control):
+                one.listen(5)
+            self.handed = activated(control, listener)
+            # It is connected, but nobody answers before there is a daemon.
+            senders = [self.sender("early"), self.sender("reply", kind="reply")]
+            self.running = self.daemon()
+            for _ in range(3):
+                self.restart(senders, self.stop)
+            said = [sender.finish() for sender in senders]
+            self.stop(self.running)
+        self.check(said)
 
     def test_what_a_killed_daemon_had_is_counted(self):
         self.running = self.daemon()
@@ -90,7 +121,7 @@ class Comeback(SystemTest):
         for _ in range(3):
             self.restart(senders, lambda daemon: daemon.kill())
         said = [sender.finish() for sender in senders]
-        self.running.stop()
+        self.stop(self.running)
         self.check(said, 3 * len(senders) * BATCH)
 
     def test_a_stopped_daemon_holds_nobody_up(self):
@@ -103,7 +134,7 @@ class Comeback(SystemTest):
         said = [late.finish(), idle.finish()]
         running.popen.send_signal(signal.SIGCONT)
         said.append(sender.finish())
-        running.stop()
+        self.stop(running)
         for one in said:
             self.assertLess(one["longest"], 1_000_000, one)
         self.check(said)
