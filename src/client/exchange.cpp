@@ -18,6 +18,7 @@ namespace key = wire::key;
 namespace {
 
 constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
+constexpr unsigned kAddedWithoutTrying = 8;
 constexpr const char* kNoWords = "The daemon has ended the connection.";
 constexpr const char* kStopped = "The daemon has stopped.";
 
@@ -156,7 +157,8 @@ void Exchange::tell(veltra_connection_state state, const char* why, ValuePointer
 // ---- Calls ----
 
 veltra_status Exchange::add(CallFrame call, CallTable::Call to) {
-  writeWaiting();  // the connection's thread may be inside a callback
+  // The connection's thread writes what waits, but it may be inside a callback.
+  if (++_added % kAddedWithoutTrying == 0) writeWaiting();
   const bool starts = call.change && call.change->starts;
   const bool awaited = to.awaitsAnswer();
   const std::uint32_t callID =
