@@ -37,12 +37,11 @@ class Figure:
     def cells(self):
         holds = {None: "", True: "yes", False: "no"}[self.holds()]
         floor = f"{self.floor}: {number(statistics.median(self.floors))}" if self.floors else ""
-        return [self.name, f"{number(statistics.median(self.values))} {self.unit}", spread(self.values), floor,
-                f"{statistics.median(self.ratios()):.2f} ({min(self.ratios()):.2f} to {max(self.ratios()):.2f})"
-                if self.floors else "", self.target(), holds]
+        return [self.name, f"{number(statistics.median(self.values))} {self.unit}".rstrip(), spread(self.values), floor,
+                f"{statistics.median(self.ratios()):.2f}" if self.floors else "", spread(self.ratios()), self.target(), holds]
 
 
-HEADINGS = ["figure", "median", "from … to", "floor, median", "ratio (from … to)", "target", "holds"]
+HEADINGS = ["figure", "median", "from … to", "floor, median", "ratio", "from … to", "target", "holds"]
 
 
 def number(value):
@@ -61,4 +60,4 @@ def text_table(rows, headings=HEADINGS):
 
 def markdown_table(rows, headings=HEADINGS):
     lines = [headings, ["---"] * len(headings), *rows]
-    return "\n".join("| " + " | ".join(line) + " |" for line in lines)
+    return "\n".join("| " + " | ".join(cell.replace("|", "\\|") for cell in line) + " |" for line in lines)

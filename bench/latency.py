@@ -1,12 +1,11 @@
 # SPDX-License-Identifier: Apache-2.0
 """send with its reply awaited at 10, 50 and 90 % of what one client reaches, beside the bare socket at the same shares of what it
 reaches."""
-import os
 import statistics
 
 from figures import number
 from measures import Measure
-from place import BATCHES_OF_1000, pin
+from place import BATCHES_OF_1000, cores, pin
 
 SHARES = (10, 50, 90)
 QUANTILES = {"p50": "p50", "p99": "p99", "p999": "p99.9"}
@@ -15,7 +14,7 @@ QUANTILES = {"p50": "p50", "p99": "p99", "p999": "p99.9"}
 class Latency(Measure):
     def round(self):
         seconds = 0.5 if self.quick else 3
-        apart = 1 if os.cpu_count() > 1 else 0
+        apart = 1 if cores() > 1 else 0
         with self.place.daemon() as daemon:
             pin(daemon.popen.pid, {apart})
             ways = {"send with reply": ("latency", self.place.root.path, BATCHES_OF_1000), "bare socket": ("bare", apart, 0)}

@@ -7,8 +7,9 @@
 //        standard
 //          input, without replies, prints the time until the last is taken in, and ends with its input)
 //        load waits ROOT CLIENT-TYPE SESSIONS MESSAGES (the same with replies, one at a time)
+//        load posts ROOT CLIENT-TYPE SESSIONS MESSAGES (the same, with a flush after each message)
 //        load latency ROOT CLIENT-TYPE RATE SECONDS (RATE 0: as fast as replies come)
-//        load bare CORE 0 RATE SECONDS
+//        load bare CORE 0 RATE SECONDS (this end of both is on core 0)
 #include <fmt/format.h>
 #include <sched.h>
 #include <sys/prctl.h>
@@ -206,18 +207,19 @@ int trips(const char* root, int clientType, int core, int rounds) {
   return 0;
 }
 
-int obey(const char* root, int clientType, int count, int messages, bool wait) {
+int obey(const char* root, int clientType, int count, int messages, const std::string& way) {
   Sessions sessions(root, clientType, count);
   say(fmt::format("{{\"sessions\": {}}}", count));
   for (int order = std::getchar(); order != EOF; order = std::getchar()) {
     const auto begin = Clock::now();
     int full = 0;
     for (int i = 0; i < messages; ++i) {
-      if (wait) {
-        sessions.sendAndWait();
-      } else {
+      if (way == "flood") {
         full += sessions.send();
+      } else {
+        sessions.sendAndWait();
       }
+      if (way == "posts") sessions.settle();
     }
     sessions.settle();
     say(fmt::format("{{\"seconds\": {:.6f}, \"messages\": {}, \"queueFull\": {}}}",
@@ -258,13 +260,16 @@ int latency(const Trip& trip, double rate, double seconds) {
 }  // namespace
 
 int main(int count, char** arguments) {
-  if (count != 6) fail("usage: load trips|flood|waits|latency|bare with four arguments; see its source");
+  if (count != 6)
+    fail("usage: load trips|flood|waits|posts|latency|bare with four arguments; see its source");
   const std::string way = arguments[1];
   const int second = std::atoi(arguments[3]);
   const int third = std::atoi(arguments[4]);
   const int fourth = std::atoi(arguments[5]);
   if (way == "trips") return trips(arguments[2], second, third, fourth);
-  if (way == "flood" || way == "waits") return obey(arguments[2], second, third, fourth, way == "waits");
+  if (way == "flood" || way == "waits" || way == "posts")
+    return obey(arguments[2], second, third, fourth, way);
+  if (way == "latency" || way == "bare") onCore(0);
   if (way == "latency") {
     Sessions session(arguments[2], second, 1);
     return latency([&] { session.sendAndWait(); }, std::atof(arguments[4]), std::atof(arguments[5]));

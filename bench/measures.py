@@ -1,13 +1,12 @@
 # SPDX-License-Identifier: Apache-2.0
 """The measurements of the message road. Each takes one value of each of its figures in every round, with the floor beside it, so
 that figure and floor meet the same machine."""
-import os
 import statistics
 import time
 
 from figures import Figure
-from place import (BATCHES_OF_1000, BATCHES_OF_50, COPIED, DATAGRAMS, REFUSED, SINGLE, Daemon, context_switches, cpu_microseconds,
-                   memory_kib, page_faults, pin, wait_until)
+from place import (BATCHES_OF_1000, BATCHES_OF_50, COPIED, DATAGRAMS, REFUSED, SINGLE, Daemon, context_switches, cores,
+                   cpu_microseconds, memory_kib, page_faults, pin, wait_until)
 
 
 class Measure:
@@ -28,7 +27,7 @@ class RoundTrip(Measure):
     """send with its reply awaited, through the library, the daemon and a back end that batches."""
 
     def round(self):
-        for name, bare, daemons in (("one", 0, {0}), ("two", 1, {1}))[:os.cpu_count()]:
+        for name, bare, daemons in (("one", 0, {0}), ("two", 1, {1}))[:cores()]:
             with self.place.daemon() as daemon:
                 pin(daemon.popen.pid, daemons)
                 got = self.place.load("trips", self.place.root.path, BATCHES_OF_1000, bare, self.scaled(300))
@@ -73,6 +72,10 @@ class Intake(Measure):
                          "one session's", self.taken["cpu1"], most=1.2)
 
 
+PARTS = {"frame": "floor: an event's frame", "list": "floor: its property list", "json": "floor: its JSON",
+         "zlib": "floor: its share of zlib", "post": "floor: its share of libcurl's post"}
+
+
 class Batches(Measure):
     """Events posted in batches, compressed and plain."""
     CASES = ((50, 6), (50, 0), (1000, 6), (1000, 0))
@@ -85,7 +88,7 @@ class Batches(Measure):
             parts = self.place.floors(events)
             case = f"{events}:{level}:"
             self.take(**{case + "cpu": cpu, case + "faults": faults, case + "switches": switches, case + "rate": rate,
-                         case + "floor": sum(parts[part] for part in ("frame", "list", "json", "zlib", "post"))})
+                         case + "floor": sum(parts[part] for part in PARTS)})
         self.place.compress(6)
         self.take(copied=flood(self.place, COPIED, 1, self.scaled(100_000))[0])
         self.take(**{"part:" + name: parts for name, parts in self.place.floors(50).items()})
@@ -100,8 +103,8 @@ class Batches(Measure):
             yield Figure(f"page faults of an event, {how}", "", self.taken[case + "faults"],
                          most=0.02 if (events, level) == (50, 6) else None)
         yield Figure("CPU of an event, posts of 50, gzip 6, with a readable copy", "µs", self.taken["copied"])
-        for part in ("frame", "list", "json", "zlib", "post", "datagram"):
-            yield Figure(f"floor of posts of 50, gzip 6: {part}", "µs", self.taken["part:" + part])
+        for part, what in PARTS.items():
+            yield Figure(f"{what}, posts of 50, gzip 6", "µs", self.taken["part:" + part])
 
 
 class SinglePosts(Measure):

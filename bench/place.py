@@ -217,6 +217,11 @@ def memory_kib(pid, *keys):
     return sum(int(re.search(rf"^{key}:\s+(\d+)", text, re.M).group(1)) for key in keys or ("Rss",))
 
 
+def cores():
+    """How many this run may use."""
+    return len(os.sched_getaffinity(0))
+
+
 def pin(pid, cores):
     for task in pathlib.Path(f"/proc/{pid}/task").iterdir():
         os.sched_setaffinity(int(task.name), cores)

@@ -11,7 +11,7 @@ import latency
 import peers
 import plot
 from figures import HEADINGS, markdown_table, text_table
-from place import SOURCE
+from place import SOURCE, cores
 
 PAGE, PLOT = SOURCE / "docs" / "performance.md", SOURCE / "docs" / "latency.svg"
 
@@ -21,7 +21,7 @@ def machine():
     processor = next((line.split(":")[1].strip() for line in pathlib.Path("/proc/cpuinfo").read_text().splitlines()
                       if line.startswith("model name")), platform.machine())
     changed = git("status", "--porcelain", "--", "src", "include", "bench") != ""
-    return [f"{os.cpu_count()} cores of {processor}, Linux {platform.release()}",
+    return [f"{cores()} of {os.cpu_count()} cores of {processor}, Linux {platform.release()}",
             f"commit {git('rev-parse', '--short=12', 'HEAD')}{' with changes' if changed else ''}",
             f"{datetime.datetime.now(datetime.UTC):%Y-%m-%d %H:%M} UTC"]
 
@@ -39,7 +39,7 @@ class Run:
 
     def facts(self):
         return [*machine(), f"load average {self.began:.2f} at the beginning, {os.getloadavg()[0]:.2f} at the end",
-                f"{self.rounds} interleaved rounds{' of a quick run' if self.quick else ''}"]
+                f"rounds, interleaved: {self.rounds}{', of a quick run' if self.quick else ''}"]
 
     def _tables(self):
         """(title, headings, rows) of each."""
@@ -80,7 +80,7 @@ of a body and posting its share with libcurl alone. No readable copies are made,
 message when it has the reply to the one before. A message that was due while the one before was under way counts from when it
 was due.""",
     "Counts": """Of the daemon, for one message whose client waits for each reply. Instructions are counted by callgrind; a wait is
-a voluntary context switch.""",
+a voluntary context switch. An event that is flushed has a post of its own, whose answer is waited for.""",
     "Beside others": """The same events, the same collector (nginx with TLS), the same number of events in a post. Each program is
 configured to read messages from a Unix socket, to parse them, to add the same eleven fields and to post JSON on one
 connection at a time, as far as it can; the others get each message as a line of syslog whose text is JSON. Under overload the

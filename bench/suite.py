@@ -1,6 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
 """The command line of scripts/bench."""
 import argparse
+import os
 import subprocess
 import sys
 
@@ -31,6 +32,7 @@ def arguments():
     parser.add_argument("--peers", action="store_true", help="also measures syslog-ng and rsyslog (Debian's packages, unpacked into "
                         "build/peers)")
     parser.add_argument("--fluent-bit", metavar="PATH", help="a Fluent Bit to measure as well")
+    parser.add_argument("--pin", action="store_true", help="everything on one core, as on a small device; writes no page")
     parser.add_argument("--no-build", action="store_true", help="takes the programs in VELTRA_BUILD as they are")
     return parser.parse_args()
 
@@ -68,6 +70,8 @@ def main():
         sys.exit(f"scripts/bench: unknown measurement {given.only}; expected one of {', '.join(map(name, MEASURES))}")
     if not given.no_build:
         build()
+    if given.pin:
+        os.sched_setaffinity(0, {0})
     place = Place()
     try:
         place.capture()
@@ -82,7 +86,7 @@ def main():
         if given.peers or given.fluent_bit:
             run.peers = peers.measure(place, given)
         print(run.terminal())
-        if not given.quick and not given.only:
+        if not given.quick and not given.only and not given.pin:
             run.write()
         return 0
     finally:

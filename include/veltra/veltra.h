@@ -122,6 +122,11 @@ VELTRA_API veltra_status veltra_reply_status(const veltra_reply* reply);
 VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* length);
 /* The back ends that report: an array of texts, or NULL if there are none. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
+/* What has become of a message in each back end when the answer was written: an array of dictionaries with
+ * the texts "backend"; "outcome", which is posted, batched, held, dropped, waiting, sent, written, delivered
+ * or none; "reason", a name for programs; "text", the same for people. Empty if the session has no back ends,
+ * NULL if the call sent no message or the daemon is older. */
+VELTRA_API const veltra_value* veltra_reply_outcomes(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
 /* True if the server has confirmed an uploaded file and the library has removed it. */
 VELTRA_API bool veltra_reply_removed(const veltra_reply* reply);

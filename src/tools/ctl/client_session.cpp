@@ -36,6 +36,9 @@ Answer answerOf(const veltra_reply* reply) {
   if (const veltra_value* backends = veltra_reply_backends(reply)) {
     answer.backends = client::valueOfNode(*backends).takeArray();
   }
+  if (const veltra_value* outcomes = veltra_reply_outcomes(reply)) {
+    answer.outcomes = client::valueOfNode(*outcomes).takeArray();
+  }
   answer.uploaded = veltra_reply_uploaded(reply);
   answer.removed = veltra_reply_removed(reply);
   const char* domain = veltra_reply_error_domain(reply);
