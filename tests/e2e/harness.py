@@ -14,6 +14,7 @@ import socket
 import ssl
 import struct
 import subprocess
+import sys
 import tempfile
 import threading
 import time
@@ -259,6 +260,18 @@ class Daemon(Process):
         assert took <= within + 0.5, f"took {took:.1f} s"
         assert not self.unexpected(), "unexpected lines:\n" + "\n".join(self.unexpected())
         return took
+
+
+# Hands the two descriptors in its arguments over like a service manager and becomes the program that follows.
+HAND_OVER = ("import os, sys; [os.dup2(int(n), 20 + i) for i, n in enumerate(sys.argv[1:3])]; "
+             "os.dup2(20, 3); os.dup2(21, 4); os.environ.update(LISTEN_FDS='2', LISTEN_PID=str(os.getpid())); "
+             "os.execv(sys.argv[3], sys.argv[3:])")
+
+
+def activated(*listeners):
+    """Options of a Daemon that gets these two listening sockets."""
+    handed = [listener.fileno() for listener in listeners]
+    return {"wrapper": (sys.executable, "-c", HAND_OVER, *map(str, handed)), "pass_fds": handed}
 
 
 START = "startConfigWithCompletionHandler:"
