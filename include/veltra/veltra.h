@@ -2,14 +2,23 @@
 /* libveltra: report to veltrad from C. See veltra.hpp for C++20.
  *
  * Threads: every function may be called from any thread; calls on one session are carried out in the order in
- * which they were made. Callbacks run one at a time on a thread of the session; a waiting call inside a
- * callback is refused with VELTRA_WOULD_DEADLOCK.
+ * which they were made. Callbacks run one at a time on a thread of the session, which the first call that
+ * needs it starts. In a callback every function may be called, but a waiting call is refused with
+ * VELTRA_WOULD_DEADLOCK, and veltra_session_close does nothing.
  *
  * No function throws. Only the functions that end in _wait, veltra_session_close and veltra_session_create
  * wait.
  *
- * Processes: exec closes the descriptors. After a fork the session belongs to the parent: the child must
- * neither use nor close it, but may open its own. No signal handler runs on a session's thread.
+ * The daemon's end: when the connection has ended, the session connects again by itself, 0.1 to 30 s after
+ * each attempt, and is described and started anew, with the user info that was last given. Calls that no
+ * connection has taken a byte of wait until then. Calls that were written and have no answer end with
+ * VELTRA_NO_REPLY and are never repeated. After veltra_session_finish there is no further connection.
+ *
+ * Processes: a session belongs to the process that made it. In a forked child every call returns
+ * VELTRA_FORKED; veltra_session_close returns at once, frees what is the child's and leaves the connection to
+ * the parent. The child may make sessions of its own. A child that a callback has forked ends when the
+ * callback returns. exec closes the descriptors; vfork and posix_spawn need nothing. No signal handler runs
+ * on a session's thread, and no function may be called in one.
  */
 #ifndef VELTRA_VELTRA_H
 #define VELTRA_VELTRA_H
@@ -26,7 +35,7 @@ extern "C" {
 
 typedef enum veltra_status {
   VELTRA_OK = 0,
-  VELTRA_NO_DAEMON = 1,      /* no daemon listens on the socket, or the connection has ended */
+  VELTRA_NO_DAEMON = 1,      /* no daemon listens on the socket, or no further connection is made */
   VELTRA_REFUSED = 2,        /* the daemon refused the connection or the call */
   VELTRA_QUEUE_FULL = 3,     /* the session's queue is full; the call was dropped and counted */
   VELTRA_INVALID = 4,        /* an argument is invalid; nothing was done */
@@ -113,6 +122,11 @@ VELTRA_API veltra_status veltra_reply_status(const veltra_reply* reply);
 VELTRA_API const char* veltra_reply_text(const veltra_reply* reply, size_t* length);
 /* The back ends that report: an array of texts, or NULL if there are none. */
 VELTRA_API const veltra_value* veltra_reply_backends(const veltra_reply* reply);
+/* What has become of a message in each back end when the answer was written: an array of dictionaries with
+ * the texts "backend"; "outcome", which is posted, batched, held, dropped, waiting, sent, written, delivered
+ * or none; "reason", a name for programs; "text", the same for people. Empty if the session has no back ends,
+ * NULL if the call sent no message or the daemon is older. */
+VELTRA_API const veltra_value* veltra_reply_outcomes(const veltra_reply* reply);
 VELTRA_API bool veltra_reply_uploaded(const veltra_reply* reply);
 /* True if the server has confirmed an uploaded file and the library has removed it. */
 VELTRA_API bool veltra_reply_removed(const veltra_reply* reply);
@@ -135,11 +149,11 @@ typedef void (*veltra_aggregation_callback)(void* context, const veltra_value* s
 
 /* The state of a session's connection. */
 typedef enum veltra_connection_state {
-  VELTRA_STATE_CONNECTING,
-  VELTRA_STATE_CONNECTED,
-  VELTRA_STATE_STARTED,
-  VELTRA_STATE_LOST,
-  VELTRA_STATE_CLOSED,
+  VELTRA_STATE_CONNECTING, /* it will connect; said again, with the reason, after each attempt that failed */
+  VELTRA_STATE_CONNECTED,  /* the daemon has accepted the connection */
+  VELTRA_STATE_STARTED,    /* the daemon has answered a start, also one that the library has made again */
+  VELTRA_STATE_LOST,       /* the connection has ended; calls under way end with VELTRA_NO_REPLY */
+  VELTRA_STATE_CLOSED,     /* there will be no further connection */
 } veltra_connection_state;
 
 /* Learns of each change. `backends`: those that report, an array of texts, or NULL; only with
@@ -209,9 +223,11 @@ typedef struct veltra_session_options {
   size_t queue_bytes;
   /* Does not describe the session on connecting: for one-shot messages, which contain a description. */
   bool undescribed;
-  /* Does not wait for a daemon, and does not fail without one. */
+  /* Neither waits for a daemon nor fails for want of one, a stuck one included: the session connects on its
+   * thread, and its calls wait. */
   bool connect_later;
-  uint32_t connect_timeout_ms; /* 0: 5,000 */
+  /* How long the daemon has to accept a connection, and how long a waiting call waits for one; 0: 5,000. */
+  uint32_t connect_timeout_ms;
   /* If not NULL, learns of each change of the connection's state, on a thread of the session. */
   veltra_state_callback state_changed;
   void* state_context;
@@ -234,9 +250,10 @@ VELTRA_API void veltra_free(char* text);
  * without it cannot begin any. The other options stay as the session was made with. Does not wait. */
 VELTRA_API veltra_status veltra_session_describe(veltra_session*, const veltra_session_options* options);
 
-/* Without _wait: VELTRA_OK means that the call was accepted and `callback` (unless NULL) will run exactly
- * once; otherwise nothing was sent and the callback will not run. With _wait: waits for the answer and
- * returns its status;
+/* Without _wait: does not wait. VELTRA_OK means that the call was accepted and `callback` (unless NULL) will
+ * run exactly once; otherwise nothing was sent and the callback will not run. With _wait: waits for the
+ * answer and returns its status; without a connection, for at most connect_timeout_ms, and then the call is
+ * not sent.
  * `*reply` (unless `reply` is NULL) is always set and must be released. */
 VELTRA_API veltra_status veltra_session_start(veltra_session*, veltra_callback, void* context);
 VELTRA_API veltra_status veltra_session_start_wait(veltra_session*, veltra_reply** reply);
@@ -298,7 +315,7 @@ VELTRA_API veltra_status veltra_session_finish_wait(veltra_session*, veltra_repl
 
 typedef struct veltra_statistics {
   uint64_t sent;           /* calls written to the daemon */
-  uint64_t dropped;        /* calls lost because the queue was full or the connection had ended */
+  uint64_t dropped;        /* calls that were refused because the queue was full, and those that were lost */
   uint64_t queued;         /* calls that now wait to be written */
   uint64_t replies;        /* answers received */
   uint64_t unanswered;     /* calls that ended without an answer */
@@ -310,13 +327,17 @@ typedef enum veltra_counter {
   VELTRA_COUNTER_LOST,        /* messages, files and log data that were accepted and then lost */
   VELTRA_COUNTER_CONNECTIONS, /* connections to the daemon that the session has had */
 } veltra_counter;
-/* 0 for an unknown counter. */
+/* A message that was accepted (VELTRA_OK, or VELTRA_NO_REPLY of a waiting call) is counted once: by the
+ * daemon, which has run it, by VELTRA_COUNTER_LOST, or by what veltra_session_close returns. After the
+ * daemon's orderly stop this is exact. After it was killed, what nobody can know counts as lost; of messages
+ * without a callback these may be up to 64 more than were under way. 0 for an unknown counter. */
 VELTRA_API uint64_t veltra_session_counter(veltra_session*, veltra_counter);
 
-/* Writes the waiting calls for at most 2 s, closes the connection, ends open calls with VELTRA_NO_REPLY
- * (their callbacks run before this returns) and frees the session. Returns the number of calls that were not
- * written. Inside a callback, or with NULL, it does nothing and returns 0. No other call on the session may
- * start after this one; waiting calls end. */
+/* Takes at most 2 s to write the waiting calls, on a further connection if need be, and to learn which were
+ * run. Then closes the connection, ends open calls with VELTRA_NO_REPLY (their callbacks run before this
+ * returns) and frees the session. Returns the number of messages, files and log data that were lost and that
+ * VELTRA_COUNTER_LOST has not told. Inside a callback, or with NULL, it does nothing and returns 0. No other
+ * call on the session may start after this one; waiting calls end. */
 VELTRA_API uint64_t veltra_session_close(veltra_session*);
 
 #ifdef __cplusplus

@@ -70,11 +70,21 @@ inline Backends backendsOf(const veltra_value* names) {
   return made;
 }
 
+// What has become of a message in one back end: the texts of veltra_reply_outcomes().
+struct Outcome {
+  std::string backend;
+  std::string outcome;
+  std::string reason;
+  std::string text;
+};
+
 // The answer to a call.
 struct Reply {
   Status status = VELTRA_OK;
   std::optional<std::string> text;
   Backends backends;
+  // Absent if the call sent no message or the daemon is older.
+  std::optional<std::vector<Outcome>> outcomes;
   bool uploaded = false;
   // An uploaded file was confirmed and removed.
   bool removed = false;
@@ -89,6 +99,12 @@ struct Reply {
     std::size_t length = 0;
     if (const char* text = veltra_reply_text(reply, &length)) made.text.emplace(text, length);
     made.backends = backendsOf(veltra_reply_backends(reply));
+    if (const veltra_value* outcomes = veltra_reply_outcomes(reply)) {
+      made.outcomes.emplace();
+      for (std::size_t at = 0; at < veltra_count(outcomes); ++at) {
+        made.outcomes->push_back(outcomeOf(veltra_array_item(outcomes, at)));
+      }
+    }
     made.uploaded = veltra_reply_uploaded(reply);
     made.removed = veltra_reply_removed(reply);
     if (const char* description = veltra_reply_error_description(reply)) {
@@ -102,6 +118,16 @@ struct Reply {
     made.status = status;
     made.error = Error{status, "", -1, veltra_status_text(status)};
     return made;
+  }
+
+ private:
+  static Outcome outcomeOf(const veltra_value* given) {
+    const auto text = [given](const char* key) {
+      std::size_t length = 0;
+      const char* found = veltra_get_string(veltra_dictionary_item(given, key), &length);
+      return found ? std::string(found, length) : std::string();
+    };
+    return {text("backend"), text("outcome"), text("reason"), text("text")};
   }
 };
 

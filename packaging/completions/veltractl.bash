@@ -3,7 +3,7 @@ _veltractl() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} path="" words="" given=0 i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | -o | --output) ((i++)) ; continue ;;
+      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output) ((i++)) ; continue ;;
     esac
     case $path+${COMP_WORDS[i]} in
       +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats) path+=/${COMP_WORDS[i]} ;;
@@ -15,11 +15,11 @@ _veltractl() {
   case $previous in
     --input | -o | --output) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
     --root) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- "$current"); return ;;
-    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | -o | --output) return ;;
+    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output) return ;;
   esac
   case $path in
     "/session") words=" --aggregate --input --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
-    "/send") words=" --category --type --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events --flag" ;;
+    "/send") words=" --category --type --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events --flag --expect" ;;
     "/one-shot") words=" --category --type --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
     "/states") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
     "/display-url") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;

@@ -25,15 +25,14 @@ void VeltraBackend::updateState() {
   setState({kBackendReporting, wire::Reason::always});
 }
 
-std::optional<std::string> VeltraBackend::sendMessage(const Dictionary* payload,
-                                                      platform::TimeValue timestamp, std::uint16_t method,
-                                                      std::uint16_t respCode, std::int32_t flag) {
+Sent VeltraBackend::sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag) {
   ++_eventID;
   return sendNumberedMessage({payload, timestamp, method, respCode, _eventID, flag});
 }
 
-std::optional<std::string> VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
-  return std::nullopt;
+Sent VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
+  return {};
 }
 
 // Back ends that override it keep the completion, hence by value.
@@ -61,10 +60,11 @@ void VeltraBackend::setFacts(SharedFacts facts) {
   _facts.swap(facts);
 }
 
-void VeltraBackend::setUserInfoDict(SharedDictionary userInfo) {
+void VeltraBackend::setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
   changed->userInfo = std::move(userInfo);
+  changed->sentUserInfo = std::move(sent);
   _facts = std::move(changed);
 }
 
@@ -83,6 +83,11 @@ std::optional<double> VeltraBackend::samplingThreshold() const {
 void VeltraBackend::setSamplingThreshold(std::optional<double> value) {
   const Lock held(_mutex);
   _samplingThreshold = value;
+}
+
+void VeltraBackend::setProhibition(std::optional<wire::Reason> reason) {
+  _prohibition.store(reason ? static_cast<int>(*reason) : -1, std::memory_order_relaxed);
+  if (reason) dropWaiting();
 }
 
 BackendActivity VeltraBackend::activity() const {

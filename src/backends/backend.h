@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "backends/lock_ranks.h"
 #include "backends/session_facts.h"
@@ -19,6 +20,7 @@
 #include "platform/counters.h"
 #include "platform/random.h"
 #include "wire/error.h"
+#include "wire/fates.h"
 #include "wire/reasons.h"
 
 namespace veltrad::backends {
@@ -44,6 +46,12 @@ struct BackendActivity {
   std::size_t held = 0;      // events that wait for a flush, datagrams that wait for the socket
   std::size_t underWay = 0;  // posts without an answer, datagrams without an acknowledgement
   std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
+};
+
+// What a back end has decided for a message, and the text about what it has sent, if there is one.
+struct Sent {
+  wire::Decision decision;
+  std::optional<std::string> text;
 };
 
 // The payload may be null.
@@ -72,10 +80,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual void cleanup() {}
   virtual void updateState();
 
-  // Numbers the message (1, 2, … 65535, 0, …) and passes it on. Returns a text about what was sent.
-  std::optional<std::string> sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
-                                         std::uint16_t method, std::uint16_t respCode, std::int32_t flag);
-  virtual std::optional<std::string> sendNumberedMessage(const NumberedMessage& message);
+  // Numbers the message (1, 2, … 65535, 0, …) and passes it on.
+  Sent sendMessage(const Dictionary* payload, platform::TimeValue timestamp, std::uint16_t method,
+                   std::uint16_t respCode, std::int32_t flag);
+  // By default the back end takes no messages.
+  virtual Sent sendNumberedMessage(const NumberedMessage& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
@@ -92,20 +101,40 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Any thread. Never null; a change of the facts does not affect those that a caller already has.
   SharedFacts facts() const;
   void setFacts(SharedFacts facts);
-  void setUserInfoDict(SharedDictionary userInfo);
+  // `sent`: what of it may leave the device.
+  void setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent);
   std::int32_t state() const { return stateVerdict().state; }
-  StateVerdict stateVerdict() const { return _state.load(std::memory_order_relaxed); }
+  // Disabled while the owner of the device forbids it.
+  StateVerdict stateVerdict() const {
+    const auto forbidden = prohibition();
+    return forbidden ? StateVerdict{kBackendDisabled, *forbidden} : ownVerdict();
+  }
+  // The same without the owner's word.
+  StateVerdict ownVerdict() const { return _state.load(std::memory_order_relaxed); }
   void setState(StateVerdict verdict) { _state.store(verdict, std::memory_order_relaxed); }
   std::int32_t hierarchy() const { return _hierarchy.load(std::memory_order_relaxed); }
   void setHierarchy(std::int32_t value) { _hierarchy.store(value, std::memory_order_relaxed); }
   std::optional<double> samplingThreshold() const;
   void setSamplingThreshold(std::optional<double> value);
   virtual BackendActivity activity() const;
+  // Why the owner of the device does not let it report; nothing: it may.
+  std::optional<wire::Reason> prohibition() const {
+    const int reason = _prohibition.load(std::memory_order_relaxed);
+    return reason < 0 ? std::nullopt : std::optional(static_cast<wire::Reason>(reason));
+  }
+  // Also drops what waits, if there is a reason.
+  void setProhibition(std::optional<wire::Reason> reason);
+  // The hosts that it may send to; empty if it sends nowhere. The session's thread.
+  virtual std::vector<std::string> hosts() const { return {}; }
+  // False if updateState() may change the hosts, so that no other thread may ask for them.
+  virtual bool hostsAreFixed() const { return true; }
   // A post begins; it ended so.
   void postBegins() { _postsUnderWay.fetch_add(1, std::memory_order_relaxed); }
   void postEnded(std::string outcome);
 
  protected:
+  // Drops and counts the events and datagrams that wait. Any thread.
+  virtual void dropWaiting() {}
   // Draws the sampling factor.
   VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
@@ -121,6 +150,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::uint16_t _eventID = 0;
 
   std::atomic<StateVerdict> _state{StateVerdict()};
+  std::atomic<int> _prohibition{-1};  // a reason; negative: none
   std::atomic<std::uint32_t> _postsUnderWay{0};
   std::atomic<std::int32_t> _hierarchy{0};
 

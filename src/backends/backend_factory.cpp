@@ -49,7 +49,7 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
 #ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
-                                           _logData, _dashboards, facts.account, oneShot},
+                                           _logData, _dashboards, facts.account, oneShot, _services.gate},
                                           name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
 #endif
@@ -77,6 +77,7 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
   }
 #endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
+  _services.counters.count(wire::Reason::unknown_backend);
   return nullptr;
 }
 

@@ -2,6 +2,7 @@
 // Makes back ends by name. Any thread.
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -18,6 +19,10 @@
 #include "support/device_identity.h"
 #include "support/veltra.h"
 
+namespace veltrad::config {
+class OwnerGate;
+}  // namespace veltrad::config
+
 namespace veltrad::backends {
 
 class CodeBundle;
@@ -25,7 +30,7 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 16 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 17 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -46,6 +51,8 @@ struct BackendServices {
   std::string scratchDirectory = "/tmp";
   // Null: every sampling factor is drawn.
   SamplingFactors* sampling = nullptr;
+  // Null: the owner sets no limits.
+  config::OwnerGate* gate = nullptr;
 };
 
 // A back end's section of a storebag. Null for a back end that reads no section.
@@ -66,6 +73,10 @@ class BackendFactory {
   void sayRest() { _posts.sayRest(); }
   // Frees memory that is kept for the next message. Called when nothing was sent for a while.
   void rest() { _posts.rest(); }
+  // Drops what waits for dashboards after its session. `refuses`: whether a host may not be reached.
+  void dropWaiting(const std::function<bool(const std::string& host)>& refuses) {
+    _dashboards->dropWaiting(refuses);
+  }
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,

@@ -52,7 +52,10 @@ struct SessionFacts {
   bool batchEvents = false;
   // Seconds since 1970.
   double startTimeStamp = 0;
+  // As the client gave it: it chooses the client entry and the family, and does not leave the device.
   SharedDictionary userInfo;
+  // The same without what the owner of the device keeps back: this may leave.
+  SharedDictionary sentUserInfo;
   std::optional<std::string> combinedSessionIDString;
   // Pays for what is kept.
   std::shared_ptr<platform::MemoryAccount> account;

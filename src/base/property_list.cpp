@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // What a binary property list declares in its trailer, and the number of objects in a value.
 #include "base/property_list.h"
-
-#include <fmt/format.h>
+#include "base/filled_text.h"
 
 #include "base/property_list_binary.h"
 
@@ -18,7 +17,7 @@ Failure<PropertyListError> malformed(std::string detail) {
 
 Result<Trailer, PropertyListError> parseTrailer(std::string_view bytes) {
   if (bytes.size() < kHeader.size() + 1 + 1 + kTrailerSize) {
-    return malformed(fmt::format("{} bytes are too few for a binary list", bytes.size()));
+    return malformed(filled("{} bytes are too few for a binary list", bytes.size()));
   }
   const std::uint64_t end = bytes.size() - kTrailerSize;
   const char* at = bytes.data() + end;
@@ -26,16 +25,16 @@ Result<Trailer, PropertyListError> parseTrailer(std::string_view bytes) {
                         bigEndian(at + 8, 8), bigEndian(at + 16, 8), bigEndian(at + 24, 8)};
   const auto& [offsetSize, referenceSize, count, top, table] = trailer;
   if (offsetSize < 1 || offsetSize > 8 || referenceSize < 1 || referenceSize > 8) {
-    return malformed(fmt::format("trailer: offsets of {} and references of {} bytes, 1 to 8 expected",
-                                 offsetSize, referenceSize));
+    return malformed(filled("trailer: offsets of {} and references of {} bytes, 1 to 8 expected", offsetSize,
+                            referenceSize));
   }
   if (table <= kHeader.size() || table >= end) {
-    return malformed(fmt::format("trailer: the table at {} lies outside the {} bytes before it", table, end));
+    return malformed(filled("trailer: the table at {} lies outside the {} bytes before it", table, end));
   }
   if (count == 0 || count > (end - table) / offsetSize) {
-    return malformed(fmt::format("trailer: {} objects in a table of {} bytes", count, end - table));
+    return malformed(filled("trailer: {} objects in a table of {} bytes", count, end - table));
   }
-  if (top >= count) return malformed(fmt::format("trailer: object {} is the top of {} objects", top, count));
+  if (top >= count) return malformed(filled("trailer: object {} is the top of {} objects", top, count));
   return trailer;
 }
 

@@ -3,12 +3,12 @@
 //
 // Layout: "bplist00", the objects, a table of their offsets, and a trailer of 32 bytes that says where the
 // table is and how wide offsets and references are. All numbers are big-endian.
-#include <fmt/format.h>
 
 #include <bit>
 #include <cstring>
 #include <limits>
 
+#include "base/filled_text.h"
 #include "base/property_list.h"
 #include "base/property_list_binary.h"
 #include "base/text.h"
@@ -72,12 +72,11 @@ class Reader {
     return false;
   }
   [[gnu::cold]] bool malformed(const Object& object, const char* what) {
-    return fail(Kind::malformed, fmt::format("object {}: {}", object.number, what));
+    return fail(Kind::malformed, filled("object {}: {}", object.number, what));
   }
 
   [[gnu::cold]] bool badOffset(std::uint64_t number, std::uint64_t offset) {
-    return fail(Kind::malformed,
-                fmt::format("object {}: offset {} lies outside the objects", number, offset));
+    return fail(Kind::malformed, filled("object {}: offset {} lies outside the objects", number, offset));
   }
 
   bool charge(std::uint64_t objects);
@@ -133,7 +132,7 @@ inline bool Reader::chargeMemory(std::uint64_t bytes) {
 
 inline bool Reader::locate(std::uint64_t number, Object& object) {
   if (number >= _trailer.count)
-    return fail(Kind::malformed, fmt::format("a reference to object {} of {}", number, _trailer.count));
+    return fail(Kind::malformed, filled("a reference to object {} of {}", number, _trailer.count));
   const std::uint64_t offset =
       bigEndian(_bytes.data() + _trailer.table + number * _trailer.offsetSize, _trailer.offsetSize);
   if (offset < kHeader.size() || offset >= _trailer.table) return badOffset(number, offset);
@@ -287,10 +286,10 @@ bool Reader::readText(Object& object, std::string& text) {
 bool Reader::enter(const Object& object, const Path* path, int depth) {
   for (; path; path = path->outer) {
     if (path->object == object.number) {
-      return fail(Kind::cyclic, fmt::format("object {} contains itself", object.number));
+      return fail(Kind::cyclic, filled("object {} contains itself", object.number));
     }
   }
-  if (depth > _depthLimit) return fail(Kind::tooDeep, fmt::format("nested deeper than {}", _depthLimit));
+  if (depth > _depthLimit) return fail(Kind::tooDeep, filled("nested deeper than {}", _depthLimit));
   return true;
 }
 
@@ -354,8 +353,8 @@ Result<Value, PropertyListError> parseBinaryPropertyList(std::string_view bytes,
     return Failure{PropertyListError{Kind::notAPropertyList, "it does not begin with \"bplist00\""}};
   }
   if (bytes.size() > limits.bytes) {
-    return Failure{PropertyListError{
-        Kind::tooLarge, fmt::format("{} bytes, at most {} are read", bytes.size(), limits.bytes)}};
+    return Failure{PropertyListError{Kind::tooLarge,
+                                     filled("{} bytes, at most {} are read", bytes.size(), limits.bytes)}};
   }
   return Reader(bytes, limits).read();
 }

@@ -2,8 +2,6 @@
 // UTF-8 (RFC 3629), lower case, percent-encoding, hexadecimal digits and log lines.
 #include "base/text.h"
 
-#include <utf8proc.h>
-
 #include <algorithm>
 #include <cstdint>
 
@@ -68,9 +66,19 @@ UTF8Character characterAt(std::string_view text, std::size_t i) {
 }
 
 void appendUTF8(std::string& text, char32_t code) {
-  utf8proc_uint8_t bytes[4];
-  const auto length = utf8proc_encode_char(static_cast<utf8proc_int32_t>(code), bytes);
-  text.append(reinterpret_cast<const char*>(bytes), static_cast<std::size_t>(length));
+  const auto put = [&text](char32_t byte) { text += static_cast<char>(byte); };
+  if (code < 0x80) return put(code);
+  if (code < 0x800) {
+    put(0xC0 | code >> 6);
+  } else if (code < 0x10000) {
+    put(0xE0 | code >> 12);
+    put(0x80 | (code >> 6 & 0x3F));
+  } else {
+    put(0xF0 | code >> 18);
+    put(0x80 | (code >> 12 & 0x3F));
+    put(0x80 | (code >> 6 & 0x3F));
+  }
+  put(0x80 | (code & 0x3F));
 }
 
 bool isUTF8(std::string_view bytes) {
@@ -105,30 +113,6 @@ std::string_view withoutIncompleteEnd(std::string_view text) {
     return incomplete ? text.substr(0, start) : text;
   }
   return text;
-}
-
-std::string lowerCase(std::string_view text) {
-  std::string out;
-  out.reserve(text.size());
-  for (std::size_t i = 0; i < text.size();) {
-    const UTF8Character character = characterAt(text, i);
-    if (character.length <= 1) {
-      const char c = text[i++];
-      out += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
-      continue;
-    }
-    appendUTF8(out, static_cast<char32_t>(utf8proc_tolower(static_cast<utf8proc_int32_t>(character.code))));
-    i += character.length;
-  }
-  return out;
-}
-
-bool equalIgnoringCase(std::string_view a, std::string_view b) {
-  return a == b || lowerCase(a) == lowerCase(b);
-}
-
-bool containsIgnoringCase(std::string_view text, std::string_view part) {
-  return lowerCase(text).find(lowerCase(part)) != std::string::npos;
 }
 
 TextPlace placeInText(std::string_view text, std::size_t offset) {

@@ -2,10 +2,10 @@
 // Conversions of values, and dictionaries as sorted vectors.
 #include "base/value.h"
 
-#include <fmt/format.h>
-
 #include <algorithm>
 #include <cmath>
+
+#include "base/filled_text.h"
 
 namespace veltrad {
 
@@ -83,15 +83,11 @@ std::optional<std::string> Value::toText() const {
     case Type::boolean:
       return std::get<bool>(_held) ? "1" : "0";
     case Type::signedInteger:
-      return fmt::format("{}", std::get<std::int64_t>(_held));
+      return textOf(std::get<std::int64_t>(_held));
     case Type::unsignedInteger:
-      return fmt::format("{}", std::get<std::uint64_t>(_held));
-    case Type::real: {
-      // fmt appends ".0" to a whole number.
-      std::string text = fmt::format("{}", std::get<double>(_held));
-      if (text.ends_with(".0")) text.resize(text.size() - 2);
-      return text;
-    }
+      return textOf(std::get<std::uint64_t>(_held));
+    case Type::real:
+      return textOf(std::get<double>(_held));
     case Type::string:
       return std::get<std::string>(_held);
     default:

@@ -44,8 +44,12 @@ Answer answerOfReply(std::string_view body) {
   const Dictionary* results = reply->dictionary(key::kResults);
   if (!results) return unreadable();
   if (const std::string* text = results->string(key::kReply)) answer->text = *text;
-  const Value* backends = results->find(key::kBackends);
-  if (backends && backends->asArray()) answer->backends = nodeOfValue(*backends);
+  if (const Value* backends = results->find(key::kBackends); backends && backends->asArray()) {
+    answer->backends = nodeOfValue(*backends);
+  }
+  if (const Value* outcomes = results->find(key::kOutcomes); outcomes && outcomes->asArray()) {
+    answer->outcomes = *outcomes;
+  }
   answer->uploaded = results->boolean(key::kUploaded).value_or(false);
   if (const Dictionary* error = results->dictionary(key::kError))
     answer->error = wire::errorOfDictionary(*error);
@@ -80,6 +84,13 @@ const char* veltra_reply_text(const veltra_reply* reply, size_t* length) {
 
 const veltra_value* veltra_reply_backends(const veltra_reply* reply) {
   return reply ? reply->backends.get() : nullptr;
+}
+
+const veltra_value* veltra_reply_outcomes(const veltra_reply* reply) {
+  if (!reply || !reply->outcomes) return nullptr;
+  std::call_once(reply->outcomesAsked,
+                 [reply] { reply->outcomesNode = veltrad::client::nodeOfValue(*reply->outcomes); });
+  return reply->outcomesNode.get();
 }
 
 bool veltra_reply_uploaded(const veltra_reply* reply) {

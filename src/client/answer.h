@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -18,6 +19,10 @@ struct veltra_reply {
   veltra_status status = VELTRA_OK;
   std::optional<std::string> text;
   veltrad::client::ValuePointer backends;
+  std::optional<veltrad::Value> outcomes;
+  // Made of them by the first question for them, which few callers ask.
+  mutable std::once_flag outcomesAsked;
+  mutable veltrad::client::ValuePointer outcomesNode;
   bool uploaded = false;
   bool removed = false;
   std::optional<veltrad::wire::ReportingError> error;

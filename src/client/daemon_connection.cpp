@@ -90,7 +90,8 @@ Answer DaemonConnection::sendAndWait(CallFrame call) {
     if (starts) startThread();  // a started session comes back by itself
     const veltra_status status = _exchange.add(std::move(call), {&waiter, nullptr, nullptr, std::move(file)});
     if (status != VELTRA_OK) return answerOfStatus(status);
-    updateWatch();
+    // A caller that can read at once need not have the thread watch for its answer.
+    if (_exchange.phase() != Phase::open || _role.holder() != ReaderRole::Holder::nobody) updateWatch();
   }
   for (Turn turn = waitForTurn(waiter, deadline); turn.reads; turn = waitForTurn(waiter, deadline))
     readUntilAnswered(waiter, turn);

@@ -3,7 +3,6 @@
 #include "client/daemon_socket.h"
 
 #include <fcntl.h>
-#include <fmt/format.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -13,6 +12,7 @@
 #include <cstring>
 #include <system_error>
 
+#include "base/filled_text.h"
 #include "base/property_list.h"
 #include "base/text.h"
 #include "client/answer.h"
@@ -44,7 +44,7 @@ const char* kindOfNonSocket(mode_t mode) {
 
 ConnectFailure notVeltrad(const std::string& shown) {
   return noDaemon(
-      fmt::format("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
+      filled("What listens on {} does not answer like veltrad: stop it and start veltrad.", shown));
 }
 
 // connect() reports a file of another kind in the same way as a socket that nobody serves.
@@ -52,36 +52,36 @@ ConnectFailure refusedConnection(const std::string& shown, const std::string& pa
   struct stat facts {};
   if (::stat(path.c_str(), &facts) == 0 && !S_ISSOCK(facts.st_mode)) {
     return noDaemon(
-        fmt::format("{} is {}, not the daemon's socket: remove it and start veltrad, or name another "
-                    "root with VELTRA_ROOT or --root.",
-                    shown, kindOfNonSocket(facts.st_mode)));
+        filled("{} is {}, not the daemon's socket: remove it and start veltrad, or name another "
+               "root with VELTRA_ROOT or --root.",
+               shown, kindOfNonSocket(facts.st_mode)));
   }
-  return noDaemon(fmt::format("The daemon that made {} has ended: start veltrad again.", shown));
+  return noDaemon(filled("The daemon that made {} has ended: start veltrad again.", shown));
 }
 
 ConnectFailure connectFailure(int error, const std::string& path, std::chrono::milliseconds patience) {
   const std::string shown = escapedForLog(path);
   switch (error) {
     case ENOENT:
-      return noDaemon(fmt::format(
+      return noDaemon(filled(
           "No daemon listens on {}: start veltrad, or name its root with VELTRA_ROOT or --root.", shown));
     case ECONNREFUSED:
       return refusedConnection(shown, path);
     case EACCES:
       return noDaemon(
-          fmt::format("This user may not open {}: make its directories searchable and the socket "
-                      "writable for everyone.",
-                      shown));
+          filled("This user may not open {}: make its directories searchable and the socket "
+                 "writable for everyone.",
+                 shown));
     case EPROTOTYPE:
-      return noDaemon(fmt::format(
-          "{} is a socket of another type, not the daemon's: remove it and start veltrad.", shown));
+      return noDaemon(
+          filled("{} is a socket of another type, not the daemon's: remove it and start veltrad.", shown));
     case EAGAIN:
       return noDaemon(
-          fmt::format("The daemon on {} accepted no connection within {} s: see whether it is stuck or "
-                      "overloaded.",
-                      shown, seconds(patience)));
+          filled("The daemon on {} accepted no connection within {} s: see whether it is stuck or "
+                 "overloaded.",
+                 shown, seconds(patience)));
     default:
-      return noDaemon(fmt::format("Connecting to {} failed: {}.", shown, errorText(error)));
+      return noDaemon(filled("Connecting to {} failed: {}.", shown, errorText(error)));
   }
 }
 
@@ -91,10 +91,9 @@ Result<sockaddr_un, ConnectFailure> addressOf(const std::string& path) {
   if (path.size() >= sizeof address.sun_path) {
     return Failure{ConnectFailure{
         VELTRA_INVALID,
-        fmt::format(
-            "The root is too long: the socket's path {} has {} bytes, and at most {} are possible; name a "
-            "shorter root with VELTRA_ROOT or --root.",
-            escapedForLog(path), path.size(), sizeof address.sun_path - 1)}};
+        filled("The root is too long: the socket's path {} has {} bytes, and at most {} are possible; name a "
+               "shorter root with VELTRA_ROOT or --root.",
+               escapedForLog(path), path.size(), sizeof address.sun_path - 1)}};
   }
   std::memcpy(address.sun_path, path.data(), path.size());
   return address;
@@ -108,7 +107,7 @@ Result<FileDescriptor, ConnectFailure> connectTo(const std::string& path,
   if (!address) return Failure{address.error()};
   const int waits = patience.count() == 0 ? SOCK_NONBLOCK : 0;
   FileDescriptor made(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | waits, 0));
-  if (!made.isOpen()) return Failure{noDaemon(fmt::format("No socket could be made: {}.", errorText(errno)))};
+  if (!made.isOpen()) return Failure{noDaemon(filled("No socket could be made: {}.", errorText(errno)))};
   const timeval bound{patience.count() / 1000, patience.count() % 1000 * 1000};
   ::setsockopt(made.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
   int failed;
@@ -138,7 +137,7 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
     const Dictionary* error = body->dictionary(key::kError);
     wire::ReportingError refusal = error ? wire::errorOfDictionary(*error) : wire::ReportingError{};
     if (refusal.description.empty()) {
-      refusal.description = fmt::format("The daemon on {} refused the connection and gave no reason.", shown);
+      refusal.description = filled("The daemon on {} refused the connection and gave no reason.", shown);
     }
     return ConnectFailure{VELTRA_REFUSED, std::move(refusal.description)};
   }
@@ -146,18 +145,17 @@ std::optional<ConnectFailure> verdictOnGreeting(const wire::Frame& frame, const 
   if (frame.header.kind != wire::FrameKind::hello || !wire) return notVeltrad(shown);
   if (*wire != wire::kWireVersion) {
     return ConnectFailure{
-        VELTRA_REFUSED,
-        fmt::format("The daemon on {} speaks version {} of the wire protocol and this library {}: "
-                    "install both from the same release.",
-                    shown, *wire, wire::kWireVersion)};
+        VELTRA_REFUSED, filled("The daemon on {} speaks version {} of the wire protocol and this library {}: "
+                               "install both from the same release.",
+                               shown, *wire, wire::kWireVersion)};
   }
   return std::nullopt;
 }
 
 ConnectFailure unansweredGreeting(const std::string& path, std::chrono::milliseconds patience) {
   return noDaemon(
-      fmt::format("The daemon on {} gave no answer within {} s: see whether it is stuck or overloaded.",
-                  escapedForLog(path), seconds(patience)));
+      filled("The daemon on {} gave no answer within {} s: see whether it is stuck or overloaded.",
+             escapedForLog(path), seconds(patience)));
 }
 
 std::optional<ConnectFailure> verdictOnPath(const std::string& path) {
@@ -218,9 +216,9 @@ Result<DaemonSocket, ConnectFailure> reachDaemon(const std::string& path, const 
       return Failure{unansweredGreeting(path, patience)};
     case Received::end:
       return Failure{
-          noDaemon(fmt::format("The daemon on {} ended the connection without a word: start veltrad "
-                               "again, or see its log.",
-                               shown))};
+          noDaemon(filled("The daemon on {} ended the connection without a word: start veltrad "
+                          "again, or see its log.",
+                          shown))};
     case Received::impossible:
       return Failure{notVeltrad(shown)};
   }

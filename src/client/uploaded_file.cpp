@@ -3,7 +3,6 @@
 #include "client/uploaded_file.h"
 
 #include <fcntl.h>
-#include <fmt/format.h>
 #include <sys/random.h>
 #include <unistd.h>
 
@@ -12,6 +11,7 @@
 #include <cstdio>
 #include <system_error>
 
+#include "base/filled_text.h"
 #include "base/text.h"
 #include "client/lent_copy.h"
 #include "wire/file_origin.h"
@@ -44,7 +44,8 @@ std::string nameAside(const std::string& name) {
   constexpr std::size_t kMostOfName = 200;  // keeps the result below 255 bytes
   std::uint64_t random[2];
   if (::getrandom(random, sizeof random, GRND_NONBLOCK) != sizeof random) return {};
-  return fmt::format(".{}.{:016x}{:016x}", name.substr(0, kMostOfName), random[0], random[1]);
+  return filled(".{}.{}", name.substr(0, kMostOfName),
+                hex({reinterpret_cast<const char*>(random), sizeof random}));
 }
 
 // 0, or an errno. Replaces nothing: if the file system lacks RENAME_NOREPLACE (NFS, some FUSE), it uses a
@@ -88,11 +89,11 @@ void UploadedFile::open() {
   }
   const std::string shown = escapedForLog(_absolutePath);
   if (!S_ISREG(_facts.st_mode)) {
-    _problem = fmt::format("{} is {}: expected a regular file.", shown, kindOfFile(_facts.st_mode));
+    _problem = filled("{} is {}: expected a regular file.", shown, kindOfFile(_facts.st_mode));
   } else if (_facts.st_size == 0) {
-    _problem = fmt::format("{} is empty.", shown);
+    _problem = filled("{} is empty.", shown);
   } else if (_facts.st_size > kMostBytes) {
-    _problem = fmt::format("{} has {} bytes: at most {} are uploaded.", shown, _facts.st_size, kMostBytes);
+    _problem = filled("{} has {} bytes: at most {} are uploaded.", shown, _facts.st_size, kMostBytes);
   } else {
     copyIfServedByOthers();
   }
@@ -107,7 +108,7 @@ void UploadedFile::copyIfServedByOthers() {
   _copy = copyOfFile(_file.get(), _facts.st_size);
   if (_copy.isOpen() || origin.kind == Kind::stacked) return;
   _problem =
-      failed(fmt::format("lies on a file system of type {} and cannot be copied", origin.fileSystem), errno);
+      failed(filled("lies on a file system of type {} and cannot be copied", origin.fileSystem), errno);
 }
 
 // Checking a path and then removing it would be a race. So the file is first renamed to a name that nobody
@@ -117,12 +118,12 @@ std::optional<std::string> UploadedFile::remove() const {
   if (::fstatat(_directory.get(), _name.c_str(), &now, AT_SYMLINK_NOFOLLOW) != 0) {
     return failed("is stored, but cannot be found any more", errno);
   }
-  const std::string other = fmt::format("{} is stored, but another file has taken its place, which stays.",
-                                        escapedForLog(_absolutePath));
+  const std::string other = filled("{} is stored, but another file has taken its place, which stays.",
+                                   escapedForLog(_absolutePath));
   if (!isSame(now)) return other;
   if (_copy.isOpen() && (now.st_size != _facts.st_size || now.st_mtim.tv_sec != _facts.st_mtim.tv_sec ||
                          now.st_mtim.tv_nsec != _facts.st_mtim.tv_nsec)) {
-    return fmt::format("{} is stored, but has changed since, so it stays.", escapedForLog(_absolutePath));
+    return filled("{} is stored, but has changed since, so it stays.", escapedForLog(_absolutePath));
   }
   const std::string aside = nameAside(_name);
   const int error = aside.empty() ? EAGAIN : moveTo(_directory.get(), _name, aside, true);
@@ -151,14 +152,14 @@ bool UploadedFile::isSame(const struct stat& other) const {
 std::string UploadedFile::putBack(const std::string& aside) const {
   const int error = moveTo(_directory.get(), aside, _name, false);
   if (error == 0) return {};
-  return fmt::format("{} is stored; another file that had taken its place is now {} beside it: {}.",
-                     escapedForLog(_absolutePath), escapedForLog(aside),
-                     std::error_code(error, std::generic_category()).message());
+  return filled("{} is stored; another file that had taken its place is now {} beside it: {}.",
+                escapedForLog(_absolutePath), escapedForLog(aside),
+                std::error_code(error, std::generic_category()).message());
 }
 
 std::string UploadedFile::failed(const std::string& what, int error) const {
-  return fmt::format("{} {}: {}.", escapedForLog(_absolutePath), what,
-                     std::error_code(error, std::generic_category()).message());
+  return filled("{} {}: {}.", escapedForLog(_absolutePath), what,
+                std::error_code(error, std::generic_category()).message());
 }
 
 }  // namespace veltrad::client

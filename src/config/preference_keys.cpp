@@ -89,6 +89,8 @@ constexpr PreferenceKey kKeys[] = {
      "Identifies this device in reports that override consent"},
     {kMain, support::kIdentifierRespectingConsent, Type::text, kUUID, isUUID, kMade, none, Effect::now, true,
      "Identifies this device in reports that respect consent"},
+    {kMain, preference::kReportingOff, Type::boolean, kTrueOrFalse, isAny, "false", fixedBoolean<false>,
+     Effect::now, false, "Nothing is reported, whatever all else says; \"veltractl privacy\" sets it"},
     {kMain, preference::kStorebagURL, Type::text, kAddress, isAddress, "the hosts of deployment.plist", none,
      Effect::nextStart, false, "The storebag server; a slash and the storebag's name are put after it"},
     {preference::kTimeDomain, preference::kAutomaticTimeZone, Type::boolean, kTrueOrFalse, isAny, "true",

@@ -20,6 +20,7 @@ inline constexpr const char* kEnvironmentType = "environmentType";
 inline constexpr const char* kForceEventLogging = "forceEventLogging";
 inline constexpr const char* kPostURL = "httpsPostURL";
 inline constexpr const char* kRealtimePostURL = "httpsRealtimePostURL";
+inline constexpr const char* kReportingOff = "ReportingOff";
 inline constexpr const char* kStorebagURL = "veltra_storebag_url";
 // In a domain of its own.
 inline constexpr const char* kTimeDomain = "com.florn.timed";

@@ -171,7 +171,8 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
     logError("fetchStorebagWithName: Signature is missing");
     return answer;
   }
-  answer.attempted = error.kind != Kind::shortage && error.kind != Kind::stopping;
+  answer.attempted =
+      error.kind != Kind::shortage && error.kind != Kind::stopping && error.kind != Kind::refused;
   logInfo("fetchStorebagWithName: Error resolving with lookup server %s, sendSynchronousRequest error %s",
           server.c_str(), error.description.c_str());
   if (name != kNameWithDefault || error.kind == Kind::stopping) return answer;

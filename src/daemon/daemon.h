@@ -10,7 +10,6 @@
 #include "config/storebag_store.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
-#include "platform/device_secret.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
@@ -19,12 +18,15 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 13 fields are these objects, in the order in which they need each other.
+// 13 fields are these objects, in the order in which they need each other, and what the owner said last.
 class Daemon {
  public:
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
+  // Reads the owner's word again and, if it has changed, stops what may not leave any more. Called several
+  // times a second.
+  void hearOwner();
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
@@ -36,7 +38,6 @@ class Daemon {
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
   config::OperatorSettings _choices;
-  platform::DeviceSecret _secret;
   backends::SamplingFactors _sampling;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;
@@ -44,6 +45,8 @@ class Daemon {
   config::StorebagStore _storebagStore;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
+  // The word has changed, and requests that had begun have been given until the next call.
+  bool _graceRuns = false;
 };
 
 }  // namespace veltrad::daemon

@@ -262,26 +262,30 @@ Check checkClientTypes(const StorebagFacts& facts) {
 
 Check checkConsent(Consent consent) {
   constexpr const char* kName = "consent";
-  constexpr const char* kKey = config::preference::kConsent;
-  constexpr const char* kGive = "veltractl config set DiagnosticLogSubmissionEnabled true";
+  const std::string key = config::preference::kConsent;
+  const std::string give = "veltractl config set " + key + " true";
   switch (consent) {
     case Consent::given:
       return ok(kName, "given");
     case Consent::refused:
       return {kName, Outcome::warning,
-              fmt::format("refused: {} is false, so only what needs no consent is reported", kKey),
-              fmt::format("the owner's choice; to change it: {}", kGive)};
+              "refused: " + key + " is false, so only what needs no consent is reported",
+              "the owner's choice; to change it: " + give};
     case Consent::neverGiven:
       return {kName, Outcome::failure,
-              fmt::format("never given: {} is not set, so only what needs no consent is reported", kKey),
-              kGive};
+              "never given: " + key + " is not set, so only what needs no consent is reported", give};
     case Consent::noBoolean:
-      return {kName, Outcome::failure, fmt::format("{} is not a boolean, which counts as refused", kKey),
-              kGive};
+      return {kName, Outcome::failure, key + " is not a boolean, which counts as refused", give};
+    case Consent::policyBroken:
+      return {kName, Outcome::failure, "nothing may leave: policy.json is broken or cannot be read",
+              "correct etc/veltrad/policy.json; the daemon's log names the line and column"};
+    case Consent::reportingOff:
+      return {kName, Outcome::warning, "nothing may leave: the owner of the device has turned reporting off",
+              "the owner's choice, in policy.json or the preference ReportingOff"};
     case Consent::notKnown:
       break;
   }
-  return {kName, Outcome::warning, fmt::format("{} cannot be read just now", kKey), "run the command again"};
+  return {kName, Outcome::warning, key + " cannot be read just now", "run the command again"};
 }
 
 Check checkMessageLog(const MachineFacts& facts) {

@@ -61,7 +61,8 @@ struct StorebagFacts {
 // The server gave no answer, so that it need not be asked for another one.
 bool endsAtServer(config::StorebagCause cause);
 
-enum class Consent { given, refused, neverGiven, noBoolean, notKnown };
+// policyBroken, reportingOff: the word of the device's owner, which stands above consent.
+enum class Consent { given, refused, neverGiven, noBoolean, notKnown, policyBroken, reportingOff };
 
 struct MachineFacts {
   Consent consent = Consent::notKnown;

@@ -110,6 +110,10 @@ StorebagFacts Doctor::storebags(StorebagCache& cache, const std::vector<std::int
 }
 
 Consent Doctor::consent() {
+  const auto refusal = _services.gate.word()->refusal;
+  if (refusal == wire::Reason::policy_broken) return Consent::policyBroken;
+  if (refusal == wire::Reason::policy_reporting || refusal == wire::Reason::privacy_off)
+    return Consent::reportingOff;
   const auto stored =
       _services.preferences.lookUp(platform::kVeltraPreferenceDomain, config::preference::kConsent);
   if (!stored) return Consent::notKnown;

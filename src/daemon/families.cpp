@@ -21,6 +21,11 @@ std::string userInfoKeyForUserInfo(const Dictionary* userInfo) {
   const std::string* service = userInfo ? userInfo->string(wire::kVeltraUserInfoServiceName) : nullptr;
   return (client ? lowerCase(*client) : "") + ":" + (service ? lowerCase(*service) : "");
 }
+
+// For log lines: the key, unless the owner of the device keeps back what it is made of.
+const char* shown(const std::string& key, const session::FamilyFacts& facts) {
+  return facts.userInfo == facts.sentUserInfo ? key.c_str() : "(kept back)";
+}
 }  // namespace
 
 void Families::tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) {
@@ -46,7 +51,7 @@ void Families::userInfoUpdatedForSession(session::FamilyFacts facts) {
   const session::Aggregation* session = facts.aggregation.get();
   left = takeOut(*session);
   logDebug("userInfoUpdatedForSession: Adding session %u to list for userInfoKey %s", facts.sessionID,
-           key.c_str());
+           shown(key, facts));
   const auto home = _correlatedSessions.try_emplace(std::pmr::string(key)).first;
   const auto member = _members.try_emplace(session, FamilyMember{std::move(facts), key, home}).first;
   home->second.join(member->second);
@@ -103,8 +108,8 @@ const CorrelatedList* Families::listHolding(const FamilyMember& member, const ch
 
 std::optional<std::string> Families::parentSessionIDString(const FamilyMember& member) const {
   if (member.level == 0) return std::nullopt;
-  logDebug("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u", member.key.c_str(),
-           member.facts.sessionID);
+  logDebug("parentSessionIDStringForSession: Checking userInfoKey '%s' for session %u",
+           shown(member.key, member.facts), member.facts.sessionID);
   const CorrelatedList* list = listHolding(member, "parentSessionIDStringForSession");
   if (!list || member.level < 0) return std::nullopt;
   AncestorIDs ids = list->ancestorIDs(member.level);
@@ -120,7 +125,7 @@ std::optional<std::string> Families::parentSessionIDString(const FamilyMember& m
 
 const FamilyMember* Families::parentSession(const FamilyMember& member) const {
   if (member.level == 0) return nullptr;
-  logDebug("parentSessionForChild: Checking userInfoKey '%s' for session %u", member.key.c_str(),
+  logDebug("parentSessionForChild: Checking userInfoKey '%s' for session %u", shown(member.key, member.facts),
            member.facts.sessionID);
   const CorrelatedList* list = listHolding(member, "parentSessionForChild");
   if (!list) return nullptr;
@@ -128,7 +133,7 @@ const FamilyMember* Families::parentSession(const FamilyMember& member) const {
   const FamilyMember* parent = list->getFirstSessionWithHierarchy(above);
   if (!parent) {
     logInfo("parentSessionForChild: Unable to find session with hierarchy of %lld for userInfoKey '%s'",
-            static_cast<long long>(above), member.key.c_str());
+            static_cast<long long>(above), shown(member.key, member.facts));
   }
   return parent;
 }

@@ -16,6 +16,7 @@
 #include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
+#include "platform/counts_record.h"
 #include "platform/log.h"
 #include "platform/process_start.h"
 #include "platform/run_loop.h"
@@ -32,6 +33,9 @@ using namespace std::chrono_literals;
 constexpr auto kStopBound = 10s;
 // How often the counters are written and the watchdog is fed.
 constexpr auto kTick = 1000ms;
+// How often the owner's word is read again in that time: a change and the end of what is under way, which
+// takes one more time, are done within a second.
+constexpr int kOwnerTicks = 3;
 // Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
 // may have.
 constexpr std::size_t kMostObservers = 64;
@@ -118,9 +122,31 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
+// Counts in a file that outlives a kill, if it can be had.
+void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord>& kept, double started) {
+  auto record = platform::CountsRecord::open(services.root.countsPath(), services.files,
+                                             services.root.countersPath(), started);
+  if (!record) {
+    logWarning("main: What a kill would lose cannot be counted: %s", record.error().c_str());
+    return;
+  }
+  kept.emplace(std::move(record).value());
+  services.counters.countIn(kept->counts());
+  if (const auto lost = services.counters.value(wire::Reason::daemon_ended)) {
+    logInfo("main: the daemon before this one was killed, and %llu events are lost",
+            static_cast<unsigned long long>(lost));
+  }
+}
+
 platform::StateFile::State countersState(const platform::Counters& counters, double started) {
   return {"The counters", [&counters] { return platform::StateFile::Version{counters.total()}; },
           [&counters, started] { return counters.json(started); }};
+}
+
+// Never written before the first thing has left.
+platform::StateFile::State allowanceState(const config::DailyAllowance& allowance) {
+  return {"The day's account", [&allowance] { return platform::StateFile::Version{allowance.version()}; },
+          [&allowance] { return allowance.text(); }};
 }
 
 platform::StateFile::State metricsState(daemon::Observers& observers) {
@@ -132,8 +158,14 @@ platform::StateFile::State metricsState(daemon::Observers& observers) {
   return {"The metrics", version, [&observers] { return observers.metricsText(); }};
 }
 
+struct StateFiles {
+  platform::StateFile& counters;
+  platform::StateFile& metrics;
+  platform::StateFile& allowance;
+};
+
 void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
-           platform::StateFile& countersFile, platform::StateFile& metricsFile, platform::RunLoop& loop) {
+           const StateFiles& files, platform::RunLoop& loop) {
   daemon::VeltradAgent& agent = daemon.agent();
   const auto watchdog = services.serviceManager.watchdogInterval();
   const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
@@ -141,9 +173,15 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
   constexpr int kTicksToReturnMemory = 3;
   int returns = 0;
   std::uint64_t accepted = 0;
+  int ownerTicks = 0;
   const auto onTick = [&] {
-    countersFile.writeSoon();
-    metricsFile.writeSoon();
+    daemon.hearOwner();
+    if (++ownerTicks < kOwnerTicks) return;
+    ownerTicks = 0;
+    services.allowance.load();
+    files.counters.writeSoon();
+    files.metrics.writeSoon();
+    if (services.allowance.version() > 0) files.allowance.writeSoon();
     // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
     const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
                       services.memory.used() == 0 && services.http.underWay() == 0;
@@ -159,7 +197,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
     }
     if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
   };
-  loop.run(tick, onTick, [&] {
+  loop.run(tick / kOwnerTicks, onTick, [&] {
     logInfo("main: SIGHUP, configuration is read again");
     daemon.readConfigurationAgain();
   });
@@ -169,7 +207,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
 // then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
 bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& control,
-          platform::StateFile& countersFile) {
+          const StateFiles& files) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
@@ -178,7 +216,8 @@ bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& co
   services.http.drain(deadline - 500ms);
   services.pool.drain(deadline - 300ms);
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
-  const bool written = countersFile.writeLast(deadline - 100ms);
+  if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
+  const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
   if (!written) logWarning("main: the disk did not take everything within the time of a stop");
   return stuck == 0 && written;
@@ -212,6 +251,8 @@ int main(int count, char** arguments) {
   platform::RunLoop loop;
   loop.blockSignals();
 
+  // Before the services, which count until they end.
+  std::optional<platform::CountsRecord> countsRecord;
   daemon::Services services(platform::Root::fromEnvironment());
   const double started = platform::timevalToSeconds(services.clock.now());
   if (!makeDirectories(services.root)) return 1;
@@ -222,10 +263,15 @@ int main(int count, char** arguments) {
     return 1;
   }
   removeUnfinishedFiles(services.root);
+  keepCounts(services, countsRecord, started);
 
   services.writer.start();
   platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
                                    services.root.countersPath());
+  platform::StateFile allowanceFile(allowanceState(services.allowance), services.files, services.writer,
+                                    services.root.allowancePath());
+  services.allowance.load();
+  services.gate.refresh();
   daemon::Daemon daemon(services);
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
                           services.counters, services.memory, services.root.entitlementsPath()},
@@ -242,9 +288,11 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  serve(services, daemon, listener, countersFile, metricsFile, loop);
+  const StateFiles files{countersFile, metricsFile, allowanceFile};
+  serve(services, daemon, listener, files, loop);
 
-  const bool ended = stop(services, listener, control, countersFile);
+  const bool ended = stop(services, listener, control, files);
+  if (ended && countsRecord) countsRecord->told();
   daemon.backends().sayRest();
   platform::VeltraLogging::stopLogging();
   if (!ended) _exit(0);

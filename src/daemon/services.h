@@ -5,11 +5,14 @@
 #include "backends/ampery/energy_log.h"
 #include "backends/dashboard/work_pool.h"
 #include "backends/mivo/code_bundle.h"
+#include "config/owner_gate.h"
+#include "config/owner_policy.h"
 #include "http/http_client.h"
 #include "ipc/entitlements.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
 #include "platform/device_properties.h"
+#include "platform/device_secret.h"
 #include "platform/disk_writer.h"
 #include "platform/file_store.h"
 #include "platform/lent_files.h"
@@ -23,7 +26,7 @@
 
 namespace veltrad::daemon {
 
-// Its 19 fields are the services of the whole process.
+// Its 23 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),
@@ -34,7 +37,11 @@ struct Services {
         transaction(serviceManager),
         energyLog(clock, counters, root.energyLogPath()),
         adaptorBundle(root.adaptorBundleDirectory(), "PellmarchPerformance"),
-        http({root.extraCertificatesPath()}) {}
+        secret(files, root.secretPath()),
+        policy(files, root.policyPath()),
+        allowance(files, clock, root.allowancePath()),
+        gate(policy, preferences, secret, allowance),
+        http({root.extraCertificatesPath(), &gate}) {}
 
   const platform::Root root;
   platform::MemoryBudget memory;
@@ -52,6 +59,10 @@ struct Services {
   platform::Counters counters;
   backends::EnergyLog energyLog;
   backends::CodeBundle adaptorBundle;
+  platform::DeviceSecret secret;
+  config::OwnerPolicy policy;
+  config::DailyAllowance allowance;
+  config::OwnerGate gate;
   http::CurlHTTPClient http;
   backends::WorkPool pool;
   platform::LentFiles lentFiles;

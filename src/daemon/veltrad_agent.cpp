@@ -46,6 +46,19 @@ void VeltradAgent::sessionInvalidated(const std::shared_ptr<session::VeltradSess
   _families.leave(session->aggregation());
 }
 
+void VeltradAgent::tellOwnersWord(const config::OwnersWord& word) {
+  for (const ListedSession& listed : _sessionList.all()) {
+    if (!listed.facts.backends) continue;
+    for (const auto& [name, backend] : *listed.facts.backends) {
+      const bool fixed = backend->hostsAreFixed();
+      const auto refusal = word.refusalFor(name, fixed ? backend->hosts() : std::vector<std::string>());
+      // The session itself finds out at its next call whether hosts that change are listed now.
+      const bool hostsUnknown = !fixed && !refusal && backend->prohibition() == wire::Reason::policy_hosts;
+      if (!hostsUnknown) backend->setProhibition(refusal);
+    }
+  }
+}
+
 std::shared_ptr<const config::StorebagSection> VeltradAgent::storebagForSession(
     const session::VeltradSession& session) {
   const std::int32_t clientType = session.clientType().value_or(0);

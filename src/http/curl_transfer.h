@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "http/connections.h"
 #include "http/http_client.h"
@@ -17,7 +18,7 @@
 namespace veltrad::http {
 
 // Constructed on the caller's thread, then used only on the HTTP thread. `connections` must exist while an
-// easy handle is attached. Its 23 fields are the request, what libcurl is given, and the answer as it
+// easy handle is attached. Its 24 fields are the request, what libcurl is given, and the answer as it
 // arrives.
 class CurlTransfer {
  public:
@@ -29,6 +30,11 @@ class CurlTransfer {
   HTTPRequest::Lane lane() const { return _request.lane; }
   // "name:port" as in the URL: connections are counted by it.
   const std::string& host() const { return _host; }
+  std::string hostName() const { return http::hostName(_request.url); }
+  std::size_t events() const { return _request.events; }
+  std::uint64_t bodySize() const { return _bodySize; }
+  // True at the first call.
+  bool beginsFirst() { return !std::exchange(_begun, true); }
   std::uintptr_t sequence() const { return _request.sequence; }
   Time arrived() const { return _arrived; }
   // True if a thread waits in perform().
@@ -88,6 +94,7 @@ class CurlTransfer {
   CURL* _easy = nullptr;
   Connections* _connections = nullptr;
   Connection _connection = Connection::kept;
+  bool _begun = false;
   HeaderList _headerList{nullptr, curl_slist_free_all};
   std::array<char, CURL_ERROR_SIZE> _error{};
   // Bytes of the body's file that were sent.

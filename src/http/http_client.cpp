@@ -18,6 +18,7 @@
 #include "base/value.h"
 #include "http/connections.h"
 #include "http/curl_transfer.h"
+#include "http/gatekeeper.h"
 #include "http/http_queue.h"
 #include "platform/log.h"
 
@@ -48,7 +49,8 @@ struct CurlHTTPClient::Impl {
   using Easy = std::unique_ptr<CURL, decltype(&curl_easy_cleanup)>;
   static constexpr std::size_t kIdleHandles = 8;
 
-  explicit Impl(HTTPClientSettings settings) : connections(std::move(settings.extraCertificatesPath)) {
+  explicit Impl(HTTPClientSettings settings)
+      : connections(std::move(settings.extraCertificatesPath)), gate(settings.gate) {
     idleHandles.reserve(kIdleHandles);
   }
 
@@ -63,6 +65,7 @@ struct CurlHTTPClient::Impl {
 
   void run();
   void stop(const HTTPQueue::Predicate& matches);
+  void endRefused(bool alsoRunning);
   void startNext();
   void startOne(Transfers one);
   bool begins(CURL* easy, CurlTransfer& transfer);
@@ -79,6 +82,7 @@ struct CurlHTTPClient::Impl {
   // Once it is true, `multi` and `thread` do not change.
   std::atomic<bool> started{false};
   Connections connections;
+  const Gatekeeper gate;
   Multi multi{nullptr, curl_multi_cleanup};
   std::thread thread;
   ServerRecords records;
@@ -142,6 +146,7 @@ void CurlHTTPClient::Impl::run() {
       stop([](const CurlTransfer&) { return true; });
     else if (orders.failBlocking)
       stop([](const CurlTransfer& transfer) { return transfer.blocking(); });
+    if (orders.askWaiting) endRefused(orders.askRunning);
     int left = 0;
     curl_multi_perform(multi.get(), &left);
     finish();
@@ -162,6 +167,24 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
   }
 }
 
+// One that is missed for lack of memory is refused when it would begin.
+void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
+  try {
+    for (Transfers taken = gate.takeRefused(queue); !taken.empty();) {
+      Transfers one = HTTPQueue::pop(taken, taken.begin());
+      // What was refused a moment ago is not put back if the gate has opened since.
+      const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
+      HTTPError refused = gate.refusalOf(one.front()).value_or(before);
+      complete(std::move(one), Failure{std::move(refused)});
+    }
+    for (auto next = running.begin(); alsoRunning && next != running.end();) {
+      const auto at = next++;
+      if (auto refused = gate.refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
+    }
+  } catch (const std::bad_alloc&) {
+  }
+}
+
 void CurlHTTPClient::Impl::startNext() {
   try {
     const auto now = std::chrono::steady_clock::now();
@@ -172,6 +195,8 @@ void CurlHTTPClient::Impl::startNext() {
 }
 
 void CurlHTTPClient::Impl::startOne(Transfers one) {
+  if (auto refused = gate.refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
+  if (auto refused = gate.overLimit(one.front())) return end(std::move(one), Failure{std::move(*refused)});
   Easy easy(nullptr, curl_easy_cleanup);
   if (idleHandles.empty()) {
     easy.reset(curl_easy_init());
@@ -250,7 +275,8 @@ void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
 // What this end could not begin, or gave up, says nothing of the server.
 void CurlHTTPClient::Impl::record(const std::string& host, const HTTPResult& result) {
   const bool own = !result && (result.error().kind == HTTPError::Kind::shortage ||
-                               result.error().kind == HTTPError::Kind::stopping);
+                               result.error().kind == HTTPError::Kind::stopping ||
+                               result.error().kind == HTTPError::Kind::refused);
   if (own) return;
   const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
   records.ended(host, result && result.value().status < 400, now.count());
@@ -286,6 +312,11 @@ HTTPResult CurlHTTPClient::perform(HTTPRequest request) {
 
 bool CurlHTTPClient::stopping() const {
   return _impl->queue.blockingFails();
+}
+
+void CurlHTTPClient::endRefused(bool running) {
+  _impl->queue.endRefused(running);
+  _impl->wake();
 }
 
 void CurlHTTPClient::failBlockingWaits() {

@@ -14,6 +14,8 @@
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
+#include "http/host_name.h"
+#include "http/request_gate.h"
 #include "http/server_records.h"
 #include "platform/memory_budget.h"
 
@@ -47,6 +49,8 @@ struct HTTPRequest {
   // What the request and its completion keep, charged by the caller and released after the completion has
   // run.
   platform::Charge charge;
+  // Events in the body; a file and log data are one.
+  std::size_t events = 1;
   // If false, the answer's body is discarded; one that is too large ends the connection, but the status
   // counts.
   bool keepsAnswer = true;
@@ -74,8 +78,9 @@ struct HTTPResponse {
 struct HTTPError {
   // transport: refused, not resolved, not trusted, cut, timed out, not https, or headers beyond their limit.
   // tooLarge: the answer is beyond its limit. tooMany: the lane is full. shortage: no descriptor, thread or
-  // memory. With tooMany and shortage nothing was sent.
-  enum class Kind { transport, tooLarge, tooMany, shortage, stopping };
+  // memory. refused: the owner of the device does not let it leave. With tooMany and shortage nothing was
+  // sent.
+  enum class Kind { transport, tooLarge, tooMany, shortage, stopping, refused };
   Kind kind = Kind::transport;
   // One line: "Could not resolve host: x".
   std::string description;
@@ -84,6 +89,8 @@ struct HTTPError {
   // Where a transport error ended the exchange.
   enum class Cause { other, resolve, connect, trust, timeout };
   Cause cause = Cause::other;
+  // Of one that was refused.
+  std::optional<wire::Reason> refusal = std::nullopt;
 };
 
 // What the request keeps until its completion has run, including libcurl's copies, without the completion
@@ -108,6 +115,8 @@ class HTTPClient {
 struct HTTPClientSettings {
   // Certificates in PEM form that are trusted besides the system's. The file may be missing.
   std::string extraCertificatesPath;
+  // Asked on the HTTP thread before each request begins; outlives the client. Null: every request may.
+  RequestGate* gate = nullptr;
 };
 
 // "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
@@ -124,6 +133,9 @@ class CurlHTTPClient final : public HTTPClient {
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 
+  // Asks the gate again for the requests that wait and, if `running`, for those that have begun; ends those
+  // that it refuses.
+  void endRefused(bool running);
   // From now on perform() fails at once; this ends calls that wait, too.
   void failBlockingWaits();
   // Waits at most until `deadline` for all transfers to end, then ends the others with `stopping`.

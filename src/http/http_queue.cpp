@@ -37,6 +37,12 @@ void HTTPQueue::stop(bool forGood) {
   _orders.last = _orders.last || forGood;
 }
 
+void HTTPQueue::endRefused(bool running) {
+  const Lock lock(_mutex);
+  _orders.askWaiting = true;
+  _orders.askRunning = _orders.askRunning || running;
+}
+
 std::future<void> HTTPQueue::addEmptyTask() {
   std::promise<void> task;
   std::future<void> passed = task.get_future();
@@ -63,7 +69,9 @@ HTTPQueue::Orders HTTPQueue::look() {
   _news = false;
   for (std::promise<void>& task : _emptyTasks) task.set_value();
   _emptyTasks.clear();
-  return _orders;
+  const Orders orders = _orders;
+  _orders.askWaiting = _orders.askRunning = false;
+  return orders;
 }
 
 // A stop may have been ordered since look(); then nothing more is begun.

@@ -41,7 +41,8 @@ class HTTPQueue {
   static constexpr std::size_t kBulkRunning = 3;
   static constexpr std::chrono::milliseconds kLongestInOrder{100};
 
-  // Called by any thread, which wakes the HTTP thread after add(), failBlocking(), stop() and addEmptyTask().
+  // Called by any thread, which wakes the HTTP thread after add(), failBlocking(), stop(), endRefused() and
+  // addEmptyTask().
 
   // more: the HTTP thread was woken before. full: the lane is full.
   enum class Added { first, more, full };
@@ -50,6 +51,7 @@ class HTTPQueue {
   void failBlocking();
   bool blockingFails() const;
   void stop(bool forGood);
+  void endRefused(bool running);
   // Ready when the HTTP thread has called look().
   std::future<void> addEmptyTask();
   // False if `deadline` passed first.
@@ -60,10 +62,13 @@ class HTTPQueue {
   // Called by the HTTP thread.
 
   // failBlocking: end the transfers of perform(). stopping: end all transfers. last: then end the thread.
+  // askWaiting, askRunning: once, end those that the gate refuses.
   struct Orders {
     bool failBlocking = false;
     bool stopping = false;
     bool last = false;
+    bool askWaiting = false;
+    bool askRunning = false;
   };
   Orders look();
   // A transfer that may run now, which is counted as running; empty if none may. If std::bad_alloc is thrown,

@@ -79,14 +79,14 @@ Refusal sendMessageWithCategory(Call& call) {
   const auto type = call.arguments.uint16(key::kType);
   if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
   call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, key::kPayload),
-                                       stringReply(std::move(call.pending)));
+                                       sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithDictionary(Call& call) {
   auto message = takenDictionary(call, key::kMessage);
   if (!message) return mustBe(key::kMessage, "a dictionary");
-  call.session.sendMessageWithDictionary(std::move(*message), stringReply(std::move(call.pending)));
+  call.session.sendMessageWithDictionary(std::move(*message), sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 
@@ -122,7 +122,7 @@ Refusal sendMessageWithSessionInfo(Call& call) {
   auto userInfo = takenDictionary(call, key::kUserInfo);
   call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
                                           takenDictionary(call, key::kPayload),
-                                          stringReply(std::move(call.pending)));
+                                          sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 

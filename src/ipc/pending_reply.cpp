@@ -59,12 +59,32 @@ void setError(Dictionary& results, const std::optional<wire::ReportingError>& er
   if (error) results.set(key::kError, wire::dictionaryOfError(*error));
 }
 
+Dictionary dictionaryOf(const wire::Outcome& outcome) {
+  const wire::Reason reason = outcome.decision.reason;
+  return {{key::kBackend, outcome.backend},
+          {key::kOutcome, wire::nameOf(outcome.decision.fate)},
+          {key::kReason, wire::entryOf(reason).name},
+          {key::kText, wire::causeOf(reason)}};
+}
+
 }  // namespace
 
 wire::StringReply stringReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::string> text) {
     Dictionary results;
+    if (text) results.set(key::kReply, std::move(*text));
+    pending->answer(std::move(results));
+  };
+}
+
+wire::SentReply sentReply(std::shared_ptr<PendingReply> pending) {
+  if (!pending) return {};
+  return [pending = std::move(pending)](std::optional<std::string> text, const wire::Outcomes& outcomes) {
+    Array encoded;
+    encoded.reserve(outcomes.size());
+    for (const wire::Outcome& outcome : outcomes) encoded.push_back(dictionaryOf(outcome));
+    Dictionary results{{key::kOutcomes, std::move(encoded)}};
     if (text) results.set(key::kReply, std::move(*text));
     pending->answer(std::move(results));
   };

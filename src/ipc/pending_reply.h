@@ -35,6 +35,7 @@ class PendingReply {
 // The callbacks for a session. Each is empty if `pending` is null, which means that the client wants no
 // reply.
 wire::StringReply stringReply(std::shared_ptr<PendingReply> pending);
+wire::SentReply sentReply(std::shared_ptr<PendingReply> pending);
 wire::NamesReply namesReply(std::shared_ptr<PendingReply> pending);
 wire::FlushReply flushReply(std::shared_ptr<PendingReply> pending);
 wire::BooleanReply uploadedReply(std::shared_ptr<PendingReply> pending);

@@ -11,23 +11,38 @@
 
 namespace veltrad::platform {
 
+// What a process has counted. It may lie in a file that outlives the process (counts_record.h).
+struct Counts {
+  // Events that a back end has taken in. Each is later counted under one reason, as posted, lost or dropped.
+  std::atomic<std::uint64_t> eventsTaken{0};
+  std::array<std::atomic<std::uint64_t>, wire::kReasonCount> ofReason{};
+};
+
 // The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970, "counts": {text: n}}, with
 // the texts of wire/reasons.def. Counts of 0 are left out.
 class Counters {
  public:
+  Counters() = default;
+  Counters(const Counters&) = delete;
+
   void count(wire::Reason reason, std::uint64_t times = 1) {
-    _counts[static_cast<std::size_t>(reason)].fetch_add(times, std::memory_order_relaxed);
+    _counts->ofReason[static_cast<std::size_t>(reason)].fetch_add(times, std::memory_order_relaxed);
   }
+  void eventTaken() { _counts->eventsTaken.fetch_add(1, std::memory_order_relaxed); }
   std::uint64_t value(wire::Reason reason) const {
-    return _counts[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
+    return _counts->ofReason[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
   }
+  // Counts there from now on, and goes on from what stands there, which must outlive it. To be called before
+  // anything is counted and before another thread exists.
+  void countIn(Counts& counts) { _counts = &counts; }
   // Of all counts. They only grow, so equal totals mean equal counts.
   std::uint64_t total() const;
   // `startedAt` is in seconds since 1970.
   std::string json(double startedAt) const;
 
  private:
-  std::array<std::atomic<std::uint64_t>, wire::kReasonCount> _counts{};
+  Counts _own;
+  Counts* _counts = &_own;
 };
 
 }  // namespace veltrad::platform

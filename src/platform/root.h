@@ -24,8 +24,11 @@ class Root {
   // For programs that look after the device.
   std::string controlSocketPath() const { return wire::controlSocketPathUnder(_directory); }
   std::string lockPath() const { return path("run/veltrad/lock"); }
+  // What the counters file shows, for the next daemon if this one is killed.
+  std::string countsPath() const { return path("run/veltrad/counts"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
+  std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }
@@ -41,6 +44,7 @@ class Root {
   std::string devicePath() const { return path("etc/veltrad/device.plist"); }
   std::string deploymentPath() const { return path("etc/veltrad/deployment.plist"); }
   std::string settingsPath() const { return path("etc/veltrad/settings.json"); }
+  std::string policyPath() const { return path("etc/veltrad/policy.json"); }
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }

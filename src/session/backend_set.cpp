@@ -38,10 +38,27 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   auto made = std::make_shared<BackendSet>();
   for (const auto& [name, profile] : storebag->backends) {
+    if (!making.word.policy->makes(name)) {
+      making.counters.count(wire::Reason::policy_backends);
+      continue;
+    }
     auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot);
-    if (backend) made->emplace(name, std::move(backend));
+    if (!backend) continue;
+    if (backend->hostsAreFixed() &&
+        making.word.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
+      making.counters.count(wire::Reason::policy_hosts);
+      backend->cleanup();
+      continue;
+    }
+    made->emplace(name, std::move(backend));
   }
   return made;
+}
+
+void forbidByWord(const BackendSet& backends, const config::OwnersWord& word) {
+  for (const auto& [name, backend] : backends) {
+    backend->setProhibition(word.refusalFor(name, backend->hosts()));
+  }
 }
 
 std::vector<std::string> reportingNames(const BackendSet& backends) {
@@ -65,13 +82,13 @@ std::int32_t hierarchyOf(const BackendSet* backends) {
 
 void syncReportingStates(const BackendSet& backends, const BackendSet* parents) {
   for (const auto& [name, backend] : backends) {
-    if (backend->state() == backends::kBackendHeld) continue;
+    if (backend->ownVerdict().state == backends::kBackendHeld) continue;
     const auto at = parents ? parents->find(name) : BackendSet::const_iterator();
     if (!parents || at == parents->end()) {
       backend->setState({backends::kBackendDisabled, wire::Reason::parent_has_none});
       continue;
     }
-    backends::StateVerdict verdict = at->second->stateVerdict();
+    backends::StateVerdict verdict = at->second->ownVerdict();
     if (verdict.state == backends::kBackendDisabled) verdict.reason = wire::Reason::parent_state;
     backend->setState(verdict);
     backend->setSamplingThreshold(at->second->samplingThreshold());

@@ -11,6 +11,7 @@
 #include "backends/backend.h"
 #include "backends/backend_factory.h"
 #include "base/value.h"
+#include "config/owner_gate.h"
 #include "config/storebag_content.h"
 #include "platform/clock.h"
 #include "platform/memory_budget.h"
@@ -27,16 +28,22 @@ struct BackendMaking {
   support::DeviceIdentity& device;
   const support::Veltra& library;
   platform::Clock& clock;
+  platform::Counters& counters;
+  const config::OwnersWord& word;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
 };
 
-// Makes a back end for each entry of the section that the factory knows; the set may be empty. Null, after
-// one error line, without a storebag or without session info. The caller sets the user info, the device's
-// identifier and the combined session ID in `facts`; the other facts are set here.
+// Makes a back end for each entry of the section that the factory knows and the owner of the device allows;
+// the set may be empty. Null, after one error line, without a storebag or without session info. The caller
+// sets the user info, the device's identifier and the combined session ID in `facts`; the other facts are set
+// here.
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
+
+// Tells the back ends what the owner's word is now. The session's thread.
+void forbidByWord(const BackendSet& backends, const config::OwnersWord& word);
 
 // The names of those that are reporting or held.
 std::vector<std::string> reportingNames(const BackendSet& backends);

@@ -24,6 +24,7 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   backends::SessionFacts facts;
   facts.device.udid = deviceID;
   facts.userInfo = message.userInfo;
+  facts.sentUserInfo = message.sentUserInfo;
   const auto set = createBackends(making, message.storebag, message.sessionInfo, std::move(facts));
   if (!set) {
     logError("sendMessageWithSessionInfo: No backends available to send single message");
@@ -34,9 +35,12 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
     logWarning("sendMessageWithSessionInfo: user info provided without requiring it.");
   }
   const platform::TimeValue time = making.clock.now();
+  for (const auto& [name, backend] : *set) backend->updateState();
+  forbidByWord(*set, making.word);
   for (const auto& [name, backend] : *set) {
-    backend->updateState();
-    const auto answer = backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    const auto [decision, answer] =
+        backend->sendMessage(message.payload, time, message.category, message.type, 0);
+    if (message.outcomes) message.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();

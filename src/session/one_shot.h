@@ -13,10 +13,13 @@ namespace veltrad::session {
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
   backends::SharedDictionary userInfo;
+  backends::SharedDictionary sentUserInfo;
   const config::StorebagSection* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   const Dictionary* payload = nullptr;
+  // Gets what became of the message, unless it is null because nobody waits for it.
+  wire::Outcomes* outcomes = nullptr;
 };
 
 // Makes the back ends that the storebag names, updates their states, sends the message with flag 0 through

@@ -10,11 +10,13 @@
 namespace veltrad::session {
 
 std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
-                                           support::MessageLog& messageLog) {
+                                           support::MessageLog& messageLog, wire::Outcomes* outcomes) {
   std::optional<std::string> result;
+  if (outcomes) outcomes->reserve(backends.size());
   for (const auto& [name, backend] : backends) {
-    auto answer =
+    auto [decision, answer] =
         backend->sendMessage(message.payload, message.time, message.category, message.type, message.flag);
+    if (outcomes) outcomes->push_back({name, decision});
     if (!answer) continue;
     messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);
     const bool replaces = backend->name() == wire::kVeltraBackendHTTPPost;

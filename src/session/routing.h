@@ -23,8 +23,9 @@ struct Message {
 };
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.
+// Adds what became of it to `outcomes`, unless that is null because nobody waits for it.
 std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
-                                           support::MessageLog& messageLog);
+                                           support::MessageLog& messageLog, wire::Outcomes* outcomes);
 
 // Calls `completion`, which may be empty, once: at the first error, or when all back ends have answered.
 void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::MessageLog& messageLog,

@@ -24,6 +24,7 @@ struct FamilyFacts {
   backends::SharedDictionary userInfo;         // null: none
   std::shared_ptr<const BackendSet> backends;  // null: none
   backends::SharedDictionary sessionInfo;      // null: none
+  backends::SharedDictionary sentUserInfo;     // what of the user info the owner does not keep back
 };
 
 // A session's place in its family. The user info may be null.

@@ -48,7 +48,8 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
       _sessionDelegate(delegate),
       _sessionIDString(std::move(sessionIDString)),
       _account(connection->memoryAccount()),
-      _aggregation(std::make_shared<Aggregation>(std::move(connection))) {
+      _aggregation(std::make_shared<Aggregation>(std::move(connection))),
+      _word(services.gate) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
 
@@ -57,7 +58,7 @@ std::string VeltradSession::description() const {
 }
 
 FamilyFacts VeltradSession::familyFacts() const {
-  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends, _sessionInfo};
+  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends, _sessionInfo, _sentUserInfo};
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {
@@ -92,11 +93,22 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
 void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
   _userInfo = std::move(info);
+  _sentUserInfo = _word.allowed(_userInfo);
+}
+
+void VeltradSession::hearOwner() {
+  while (_word.hear()) {
+    _sentUserInfo = _word.allowed(_userInfo);
+    if (!_backends) continue;
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
+    updateSessionWithDefaultSessionInfo();
+  }
 }
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", _sessionID);
   const auto storebag = _sessionDelegate.storebagForSession(*this);
+  hearOwner();
   if (!storebag) {
     _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
@@ -105,6 +117,7 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   _storebagVersion = _sessionDelegate.storebagVersionForSession(*this);
   createBackendsWithStorebag(*storebag);
   updateSessionWithDefaultSessionInfo();
+  hearOwner();
   internalSendMessage(
       startMessagePayload(_services.device, _services.library, _services.preferences, _services.locale), 0,
       0);
@@ -118,10 +131,11 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   backends::SessionFacts facts;
   facts.device.udid = _deviceid;
   facts.userInfo = _userInfo;
+  facts.sentUserInfo = _sentUserInfo;
   facts.combinedSessionIDString = _sessionIDString;
-  auto made =
-      createBackends({_services.factory, _services.device, _services.library, _services.clock, _account},
-                     &storebag, _sessionInfo.get(), std::move(facts));
+  auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock,
+                              _services.counters, _word.now(), _account},
+                             &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   // Clean up the back ends that a second start has replaced.
   if (made) {
@@ -135,6 +149,9 @@ void VeltradSession::updateSessionWithDefaultSessionInfo() {
     for (const auto& [name, backend] : *_backends) backend->updateState();
   }
   _sessionDelegate.updateDownstreamSessions(familyFacts());
+  // After the daemon was told of the back ends: a word that came before that is heard here, a later one
+  // there.
+  if (_backends) forbidByWord(*_backends, _word.now());
 }
 
 std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
@@ -145,6 +162,7 @@ std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() c
 void VeltradSession::fetchStatesWithUserInfo(wire::OptionalDictionary userInfo,
                                              wire::NamesReply completionHandler) {
   logDebug("fetchStatesWithUserInfo: Fetching states for session %u", _sessionID);
+  hearOwner();
   backends::SharedDictionary identity;
   if (charged(std::move(userInfo), identity)) receivedUserInfo(std::move(identity));
   if (completionHandler) completionHandler(fetchReportingStates());
@@ -162,7 +180,7 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
                          sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
   keepUserInfo(std::move(updated));
   if (_backends) {
-    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
   }
   if (unchanged) return _sessionDelegate.sessionInfoUpdated(familyFacts());
   logDebug("receivedUserInfo: Received new user info for session %u", _sessionID);
@@ -186,36 +204,40 @@ void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
 }
 
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
-                                             wire::OptionalDictionary payload, wire::StringReply reply) {
+                                             wire::OptionalDictionary payload, wire::SentReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(category, type, std::move(payload));
-  if (reply) reply(answer);
+  wire::Outcomes outcomes;
+  auto answer = sendMessageWithCategory(category, type, std::move(payload), reply ? &outcomes : nullptr);
+  if (reply) reply(std::move(answer), std::move(outcomes));
 }
 
-void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::StringReply reply) {
+void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::SentReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
-  const auto answer = sendMessageWithDictionary(message, Origin::client);
-  if (reply) reply(answer);
+  wire::Outcomes outcomes;
+  auto answer = sendMessageWithDictionary(message, reply ? &outcomes : nullptr, Origin::client);
+  if (reply) reply(std::move(answer), std::move(outcomes));
 }
 
 void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
   logDebug("finishSessionWithReply: Finishing session %u", _sessionID);
-  const auto answer = sendMessageWithCategory(0, 2, std::nullopt);
+  const auto answer = sendMessageWithCategory(0, 2, std::nullopt, nullptr);
   if (reply) reply(answer);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
-                                                                   Origin origin) {
+                                                                   wire::Outcomes* outcomes, Origin origin) {
   Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
                      {wire::kVeltraMessageParametersFlag, 0u},
                      {wire::kVeltraMessageParametersType, unsigned{type}}};
   if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
-  return sendMessageWithDictionary(message, origin);
+  return sendMessageWithDictionary(message, outcomes, origin);
 }
 
 std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
+                                                                     wire::Outcomes* outcomes,
                                                                      Origin origin) {
+  hearOwner();
   if (!_backends) {
     logDebug("sendMessageWithDictionary: No backends available to send message");
     if (origin == Origin::client) {
@@ -237,7 +259,9 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   }
   const auto category16 = static_cast<std::uint16_t>(*category);
   const auto type16 = static_cast<std::uint16_t>(*type);
-  const Dictionary* payload = message.dictionary(wire::kVeltraMessageParametersPayload);
+  std::optional<Dictionary> changed;
+  const Dictionary* payload =
+      _word.allowed(message.dictionary(wire::kVeltraMessageParametersPayload), changed);
   const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
   const platform::TimeValue time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
@@ -246,12 +270,13 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dicti
   if (hierarchy > 0 || _aggregation->active()) {
     aggregateMessage(hierarchy, platform::timevalToSeconds(time), category16, type16, payload);
   }
-  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog);
+  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog,
+                         outcomes);
 }
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), Origin::session);
+  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), nullptr, Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
@@ -269,7 +294,7 @@ void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, 
   // A root has no ancestors, so it does not need the families' lock.
   const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
   if (!toAncestor && !_aggregation->active()) return;
-  const std::string copy = aggregatedCopy(_sessionInfo, _userInfo, timestamp, category, type, payload);
+  const std::string copy = aggregatedCopy(_sessionInfo, _sentUserInfo, timestamp, category, type, payload);
   CopySent sent;
   if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
   if (!sent.taken) sent = _aggregation->sendToAggregator(copy);
@@ -278,17 +303,21 @@ void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, 
 
 void VeltradSession::flushMessagesWithCompletion(wire::FlushReply completion) {
   logDebug("flushMessagesWithCompletion: Flushing messages for session %u", _sessionID);
+  hearOwner();
   flushBackends(_backends.get(), _services.flushes, _services.messageLog, std::move(completion));
 }
 
 void VeltradSession::uploadFileAtPath(std::string path, std::string extensionToken,
                                       wire::BooleanReply completionHandler) {
   logDebug("uploadFileAtPath: Uploading file for session %u", _sessionID);
+  hearOwner();
   const bool uploaded = uploadFile(_backends.get(), path, extensionToken, _services.messageLog);
   if (completionHandler) completionHandler(uploaded);
 }
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
+  hearOwner();
+  _word.restrict(logData);
   const bool uploaded = uploadLogDataArray(_backends.get(), logData);
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
@@ -296,7 +325,7 @@ void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply compl
 void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
                                                 wire::OptionalDictionary userInfo, std::uint16_t category,
                                                 std::uint16_t type, wire::OptionalDictionary payload,
-                                                wire::StringReply reply) {
+                                                wire::SentReply reply) {
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
@@ -316,15 +345,20 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
     _services.counters.count(wire::Reason::no_storebag);
-    if (reply) reply("storebag not available");
+    if (reply) reply("storebag not available", {});
     return;
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
+  hearOwner();
+  std::optional<Dictionary> changed;
+  wire::Outcomes outcomes;
   veltrad::session::sendMessageWithSessionInfo(
-      {_services.factory, _services.device, _services.library, _services.clock, _account, true},
+      {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
+       _word.now(), _account, true},
       _services.messageLog,
-      {kept.get(), identity, storebag.get(), category, type, payload ? &*payload : nullptr});
-  if (reply) reply("finished");
+      {kept.get(), identity, _word.allowed(identity), storebag.get(), category, type,
+       _word.allowed(payload ? &*payload : nullptr, changed), reply ? &outcomes : nullptr});
+  if (reply) reply("finished", std::move(outcomes));
 }
 
 void VeltradSession::end() {

@@ -18,6 +18,7 @@
 #include "platform/memory_budget.h"
 #include "platform/preferences.h"
 #include "session/backend_set.h"
+#include "session/heard_word.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
 
@@ -39,6 +40,7 @@ struct SessionServices {
   platform::Counters& counters;
   FlushCounters& flushes;
   support::MessageLog& messageLog;
+  const config::OwnerGate& gate;
 };
 
 // The agent's list and the connection own it. The delegate outlives it.
@@ -56,8 +58,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
                                wire::NamesReply completionHandler) override;
   void fetchDisplayURL(wire::StringReply reply) override;
   void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, wire::OptionalDictionary payload,
-                               wire::StringReply reply) override;
-  void sendMessageWithDictionary(Dictionary message, wire::StringReply reply) override;
+                               wire::SentReply reply) override;
+  void sendMessageWithDictionary(Dictionary message, wire::SentReply reply) override;
   void flushMessagesWithCompletion(wire::FlushReply completion) override;
   void finishSessionWithReply(wire::StringReply reply) override;
   void uploadFileAtPath(std::string path, std::string extensionToken,
@@ -65,7 +67,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) override;
   void sendMessageWithSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                   std::uint16_t category, std::uint16_t type,
-                                  wire::OptionalDictionary payload, wire::StringReply reply) override;
+                                  wire::OptionalDictionary payload, wire::SentReply reply) override;
   // Sends the stop message, flushes, and cleans up and releases the back ends.
   void end() override;
   std::string description() const override;
@@ -79,6 +81,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
+  // Takes the owner's word over if it has changed, also into the back ends.
+  void hearOwner();
   void createBackendsWithStorebag(const config::StorebagSection& storebag);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
@@ -89,11 +93,13 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // Messages of the session itself are not counted as lost.
   enum class Origin { client, session };
   // These check the message, pass it to the aggregating client and every back end, and return the answer for
-  // the client.
+  // the client. `outcomes` is null if nobody waits for them.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      wire::OptionalDictionary payload,
+                                                     wire::Outcomes* outcomes,
                                                      Origin origin = Origin::client);
-  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, Origin origin);
+  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, wire::Outcomes* outcomes,
+                                                       Origin origin);
   void sayWithoutUserInfo();
   void aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category, std::uint16_t type,
                         const Dictionary* payload);
@@ -116,6 +122,9 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
   backends::SharedDictionary _userInfo;
+  // What of it may leave the device.
+  backends::SharedDictionary _sentUserInfo;
+  HeardWord _word;
   std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };

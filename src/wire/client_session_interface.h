@@ -11,6 +11,7 @@
 
 #include "base/value.h"
 #include "wire/error.h"
+#include "wire/fates.h"
 
 namespace veltrad::wire {
 
@@ -20,6 +21,8 @@ template <typename... Results>
 using Reply = std::function<void(Results...)>;
 
 using StringReply = Reply<std::optional<std::string>>;
+// Of a message: what each back end has done with it until now.
+using SentReply = Reply<std::optional<std::string>, Outcomes>;
 using NamesReply = Reply<std::optional<std::vector<std::string>>>;
 using FlushReply = Reply<std::optional<std::string>, std::optional<ReportingError>>;
 using BooleanReply = Reply<bool>;
@@ -38,8 +41,8 @@ class ClientSessionInterface {
   virtual void fetchStatesWithUserInfo(OptionalDictionary userInfo, NamesReply completionHandler) = 0;
   virtual void fetchDisplayURL(StringReply reply) = 0;
   virtual void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, OptionalDictionary payload,
-                                       StringReply reply) = 0;
-  virtual void sendMessageWithDictionary(Dictionary message, StringReply reply) = 0;
+                                       SentReply reply) = 0;
+  virtual void sendMessageWithDictionary(Dictionary message, SentReply reply) = 0;
   virtual void flushMessagesWithCompletion(FlushReply completion) = 0;
   virtual void finishSessionWithReply(StringReply reply) = 0;
   // `extensionToken` names the file that the client lent; empty if it lent none.
@@ -48,7 +51,7 @@ class ClientSessionInterface {
   virtual void uploadLogData(Array logData, UploadLogDataReply completionHandler) = 0;
   virtual void sendMessageWithSessionInfo(OptionalDictionary sessionInfo, OptionalDictionary userInfo,
                                           std::uint16_t category, std::uint16_t type,
-                                          OptionalDictionary payload, StringReply reply) = 0;
+                                          OptionalDictionary payload, SentReply reply) = 0;
 
   // The last call, made once, after the connection's invalidation handler has run.
   virtual void end() = 0;

@@ -3,7 +3,6 @@
 #include "wire/file_origin.h"
 
 #include <fcntl.h>
-#include <fmt/format.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -11,6 +10,7 @@
 #include <cerrno>
 
 #include "base/file_descriptor.h"
+#include "base/filled_text.h"
 
 namespace veltrad::wire {
 
@@ -66,14 +66,14 @@ std::optional<std::string> typeOfMount(std::string_view mountInfo, std::string_v
 FileOrigin FileOrigin::of(int descriptor, pid_t lender) {
   // The mount of memory files is in no list. Only they have seals.
   if (::fcntl(descriptor, F_GET_SEALS) >= 0) return {Kind::local, "tmpfs"};
-  const std::string facts = contentOf(fmt::format("/proc/self/fdinfo/{}", descriptor));
+  const std::string facts = contentOf(filled("/proc/self/fdinfo/{}", descriptor));
   const std::string_view mount = wordAfter(facts, "mnt_id:");
   if (const auto type = typeOfMount(contentOf("/proc/self/mountinfo"), mount)) {
     return {kindOfFileSystem(*type), *type};
   }
   if (lender <= 0) return {};
   // Mount numbers are unique in the kernel, so it does no harm if another process has this number by now.
-  const auto type = typeOfMount(contentOf(fmt::format("/proc/{}/mountinfo", lender)), mount);
+  const auto type = typeOfMount(contentOf(filled("/proc/{}/mountinfo", lender)), mount);
   if (!type) return {};
   const Kind kind = kindOfFileSystem(*type);
   return {kind == Kind::local ? Kind::local : Kind::foreign, *type};

@@ -80,8 +80,15 @@ inline constexpr const char* kUserInfo = "userInfo";
 
 // Results.
 inline constexpr const char* kBackends = "backends";
+inline constexpr const char* kOutcomes = "outcomes";
 inline constexpr const char* kReply = "reply";
 inline constexpr const char* kUploaded = "uploaded";
+
+// Of an outcome.
+inline constexpr const char* kBackend = "backend";
+inline constexpr const char* kOutcome = "outcome";
+inline constexpr const char* kReason = "reason";
+inline constexpr const char* kText = "text";
 }  // namespace key
 
 }  // namespace veltrad::wire

@@ -37,4 +37,11 @@ constexpr const ReasonEntry& entryOf(Reason reason) {
   return kReasons[static_cast<std::size_t>(reason)];
 }
 
+// The part of its text that says why.
+constexpr std::string_view causeOf(Reason reason) {
+  const std::string_view text = entryOf(reason).text;
+  const std::size_t colon = text.find(": ");
+  return colon == std::string_view::npos ? text : text.substr(colon + 2);
+}
+
 }  // namespace veltrad::wire

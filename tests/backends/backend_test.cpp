@@ -13,18 +13,18 @@ namespace {
 
 struct Counting final : backends::VeltraBackend {
   explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
-  std::optional<std::string> sendNumberedMessage(const backends::NumberedMessage& message) override {
-    return std::to_string(message.eventID);
+  backends::Sent sendNumberedMessage(const backends::NumberedMessage& message) override {
+    return {{}, std::to_string(message.eventID)};
   }
 };
 
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   FakeRandom random;
   const auto backend = std::make_shared<Counting>(random);
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "1");
+  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "1");
   for (int i = 2; i < 65'536; ++i) backend->sendMessage(nullptr, {}, 0, 0, 0);
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "0");
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0), "1");
+  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "0");
+  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "1");
   for (const auto& [text, major, minor] :
        {std::tuple{"9.3", 9, 3}, {"10", 10, 0}, {"300.1", 44, 1}, {"x.y", 0, 0}, {"8.0.7", 8, 0}}) {
     const auto version = backends::SelfVersion::of(text);
@@ -45,7 +45,7 @@ TEST(VeltraBackend, ItsFactsChangeAsAWholeAndOnlyWhereTheyAreToldTo) {
     for (int i = 0; i <= 1000; ++i) backend.setCorrelatedSessionID("ancestor." + std::to_string(i));
   });
   for (int i = 0; i <= 1000; ++i)
-    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}));
+    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}), nullptr);
   other.join();
   const auto now = backend.facts();
   EXPECT_EQ(now->sessionID, 7u);

@@ -101,7 +101,8 @@ TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
   for (const auto& [backend, flags] : cases) {
-    const auto line = backend->sendNumberedMessage({&payload, kTime, 1, 0, 5, 0});
+    const auto [decision, line] = backend->sendNumberedMessage({&payload, kTime, 1, 0, 5, 0});
+    EXPECT_EQ(decision.fate, (flags & 1) ? wire::Fate::waiting : wire::Fate::sent);
     EXPECT_EQ(server.receive(), "\x02\x07\x01\x1E\x53\x72\x4E\x00\xFF\xFF\xED\xCB\xFF\xFC\xFF\xA6\0\1\0\0"s +
                                     kDevice + "\0\5\0"s + flags + " codec=opus with 18 chars");
     EXPECT_EQ(line, "1400000000.120 " + kDevice +
@@ -132,7 +133,7 @@ TEST_F(Dashboard, ThePayloadBecomesText) {
            {{{"key", longText + "=\xC3\xA9"}, {"z", longText + "later"}},
             " key=" + longText + "\\=\xC3",
             1}}) {
-    const auto line = backend->sendMessage(&c.payload, kTime, 65'535, 0, 0);
+    const auto line = backend->sendMessage(&c.payload, kTime, 65'535, 0, 0).text;
     EXPECT_EQ(server.receive().substr(64), c.text);
     EXPECT_TRUE(line && line->ends_with(" 65535     0 " + c.text.substr(0, c.text.size() - c.lostByTheLine)));
   }

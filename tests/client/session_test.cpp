@@ -65,5 +65,25 @@ TEST(Session, RefusesAWaitInsideACallbackAndServesOthersWhileItTakesLong) {
   inside.session.reset();  // before what its callback uses
 }
 
+TEST(Session, LearnsWhatBecameOfAMessageUnlessTheDaemonIsOlder) {
+  const Dictionary outcome{
+      {"backend", "httppost"}, {"outcome", "dropped"}, {"reason", "no_consent"}, {"text", "why"}};
+  FakeDaemon daemon([&](WireEnd& link, const Received& call) {
+    if (call.callID == 0) return;
+    link.send(replyFrame(call.callID, call.args().uint16("category") == 1
+                                          ? Dictionary{{"outcomes", Array{outcome, Dictionary{}}}}
+                                          : Dictionary{{"outcomes", "none"}}));
+  });
+  veltra::Session session = open(daemon);
+  const auto outcomes = session.sendAndWait(1, 1, {}).outcomes;
+  ASSERT_TRUE(outcomes);
+  ASSERT_EQ(outcomes->size(), 2u);
+  const auto& [backend, what, reason, text] = outcomes->front();
+  EXPECT_THAT((std::vector{backend, what, reason, text}),
+              ElementsAre("httppost", "dropped", "no_consent", "why"));
+  EXPECT_EQ(outcomes->back().backend, "");
+  EXPECT_FALSE(session.sendAndWait(2, 1, {}).outcomes);
+}
+
 }  // namespace
 }  // namespace veltrad::client_test

@@ -69,6 +69,10 @@ TEST(Diagnosis, NamesWhatIsWrongAndNothingElse) {
        "refresh"},
       {[](Facts& facts) { facts.machine.consent = daemon::Consent::notKnown; }, "consent", "warning",
        "again"},
+      {[](Facts& facts) { facts.machine.consent = daemon::Consent::policyBroken; }, "consent", "failure",
+       "policy.json"},
+      {[](Facts& facts) { facts.machine.consent = daemon::Consent::reportingOff; }, "consent", "warning",
+       "ReportingOff"},
       {[](Facts& facts) { facts.machine.sandboxInForce = false; }, "sandbox", "warning", "Landlock"},
       {[](Facts& facts) { facts.machine.now = 86'400; }, "clock", "failure", "timedatectl"}};
   for (const auto& [broken, name, result, word] : table) {

@@ -85,7 +85,7 @@ struct Session {
         Dictionary{{wire::kVeltraUserInfoClientName, name}, {wire::kVeltraUserInfoServiceName, "ringer"}});
   }
   session::FamilyFacts facts() const {
-    return {aggregation, static_cast<std::uint32_t>(id[0]), id, userInfo, set, nullptr};
+    return {aggregation, static_cast<std::uint32_t>(id[0]), id, userInfo, set, nullptr, userInfo};
   }
   session::FamilyPlace place() const { return {*aggregation, userInfo, session::hierarchyOf(set.get())}; }
   // Combined ID, state, whose threshold, "!" while it aggregates.

@@ -364,8 +364,8 @@ def storebag(version="v1", backends=None, **more):
 class SystemTest(unittest.TestCase):
     """A root directory, a lab that serves "quindle" and "ostvane", and daemons, which are stopped and checked at the end."""
     lab_arguments = ()
-
     def setUp(self):
+        self.opened = []
         self.root = Root()
         self.addCleanup(self.root.remove)
         self.lab = Lab(*self.lab_arguments)
@@ -396,12 +396,17 @@ class SystemTest(unittest.TestCase):
         except BaseException:
             daemon.kill()  # so that the next row of a table can start its own
             raise
+        finally:
+            opened, self.opened = self.opened, []
         daemon.stop()
+        for ctl in opened:  # else it would come back to the next daemon
+            ctl.kill()
 
     def open(self, *arguments, deadline=DEADLINE, **options):
         """Starts a session with veltractl; returns it and the answer to its start."""
         ctl = Ctl(self.root, *arguments, **options)
         self.addCleanup(ctl.kill)
+        self.opened.append(ctl)
         answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]

@@ -4,7 +4,7 @@ import json
 import subprocess
 import time
 
-from harness import IDENTITY, SOURCE, SystemTest, program, wait_until
+from harness import IDENTITY, SOURCE, SystemTest, program, storebag, wait_until
 
 
 class Road(SystemTest):
@@ -102,6 +102,57 @@ class Ctl(SystemTest):
             for command, answer in (("states", "httppost"), ("display-url", "https://display.example/phone")):
                 self.assertIn(answer, self.ctl(command, *identity)[0])
             daemon.wait_for_line("was invalidated", 3)
+
+    def test_what_became_of_a_message(self):
+        """The answer to a send says what each back end did with it, and why."""
+        identity = ["--client-type", "7", "--client", "phone", "--require-user-info"]
+        others = {"dashboard": {"ip": "127.0.0.1", "port": self.lab.dashboard[1], "reliable": 100}, "ampery": {},
+                  "uploadserver": {"post_url": "${url}/upload"}}
+        cases = [  # consent, entry, flag: what became of it in httppost
+            (True, {}, "1", ("posted", "reports", "its client entry lets it")),
+            (True, {"expedite": 0}, "0", ("batched", "reports", "its client entry lets it")),
+            (False, {}, "1", ("dropped", "no_consent", "no consent to diagnostic submission")),
+            (True, {"sampling_threshold": -1, "override_sampling": -1}, "1", ("dropped", "sampled_out", "sampled out")),
+            (True, {"sampling_threshold": -1}, "1", ("held", "held_by_sampling", "sampled out, may be overridden"))]
+        for consent, entry, flag, (outcome, reason, text) in cases:
+            with self.subTest(reason=reason, outcome=outcome):
+                self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
+                bag = storebag("v2", **entry)
+                self.lab.put("quindle", {**bag, "release": {**bag["release"], **others}})
+                with self.serving("filters are required."):
+                    out, said = self.ctl("send", *identity, "--category", "9", "--type", "4", "--flag", flag, "a=b")
+                self.assertEqual(json.loads(out)["outcomes"], [
+                    {"backend": name, "outcome": outcome, "reason": reason, "text": text}
+                    for name, outcome, reason, text in (
+                        ("ampery", "written", "always", "its kind always does"),
+                        ("dashboard", "waiting", "always", "its kind always does"),
+                        ("httppost", outcome, reason, text),
+                        ("uploadserver", "none", "takes_no_messages", "it takes none"))])
+                self.assertIn(f"httppost: {outcome}: {text} ({reason})\n", said)
+        with self.serving("Could not find storebag name for client type 2"):
+            self.ctl("send", "--expect", "reported", *identity, "--category", "9", "--type", "4", "a=b")  # by others
+            self.lab.put("ostvane", storebag(sampling_threshold=-1, override_sampling=-1))
+            for client_type in ("2", "14"):
+                out, said = self.ctl("send", "--expect", "reported", "--client-type", client_type, *identity[2:],
+                                     "--category", "9", "--type", "4", status=1)
+                self.assertIn("No back end reports the message.", said)
+            self.assertIn("0 to 17", self.ctl("send", "--client-type", "18", "--category", "9", "--type", "4", status=1)[1])
+            self.assertIn("0 to 3", self.ctl("send", "--category", "9", "--type", "4", "--flag", "4", status=2)[1])
+
+    def test_what_a_killed_daemon_had_taken_in_is_counted_by_the_next(self):
+        daemon = self.daemon()
+        session, _ = self.open(7, "--batch-events")
+        for _ in range(4):
+            session.send(codec="opus")
+        daemon.kill()
+        session.kill()
+        with self.serving():
+            pass
+        # The session's start message and the four.
+        self.assertEqual(self.counts()["event lost: the daemon before this one ended"], 5)
+        with self.serving():
+            pass
+        self.assertNotIn("event lost: the daemon before this one ended", self.counts())
 
     def test_one_shot(self):
         """One message without a session; a call that the daemon does not answer ends immediately."""

@@ -22,10 +22,11 @@ class AnsweringSession : public wire::ClientSessionInterface {
   }
   void fetchDisplayURL(wire::StringReply reply) override { answer(reply, "URL not available"); }
   void sendMessageWithCategory(std::uint16_t, std::uint16_t, wire::OptionalDictionary d,
-                               wire::StringReply reply) override {
-    answer(reply, d && d->string("text") ? std::optional(*d->string("text")) : std::nullopt);
+                               wire::SentReply reply) override {
+    answer(reply, d && d->string("text") ? std::optional(*d->string("text")) : std::nullopt,
+           wire::Outcomes{});
   }
-  void sendMessageWithDictionary(Dictionary, wire::StringReply) override { ++calls; }
+  void sendMessageWithDictionary(Dictionary, wire::SentReply) override { ++calls; }
   void flushMessagesWithCompletion(wire::FlushReply reply) override {
     answer(reply, "flushed", std::nullopt);
   }
@@ -35,8 +36,8 @@ class AnsweringSession : public wire::ClientSessionInterface {
     answer(reply, data.empty(), wire::makeReportingError("refused", 403));
   }
   void sendMessageWithSessionInfo(wire::OptionalDictionary, wire::OptionalDictionary, std::uint16_t,
-                                  std::uint16_t, wire::OptionalDictionary, wire::StringReply reply) override {
-    answer(reply, "finished");
+                                  std::uint16_t, wire::OptionalDictionary, wire::SentReply reply) override {
+    answer(reply, "finished", wire::Outcomes{});
   }
   void end() override {}
   std::string description() const override { return "answering session"; }

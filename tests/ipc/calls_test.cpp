@@ -47,15 +47,15 @@ TEST(Calls, ThatCannotBeReadSayWhyAndInterruptNothingElse) {
 
 TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   Door door;
-  std::vector<wire::StringReply> held;  // the connection's thread's until the journal says so
-  door.onMessage = [&](std::uint16_t category, wire::StringReply reply) {
+  std::vector<wire::SentReply> held;  // the connection's thread's until the journal says so
+  door.onMessage = [&](std::uint16_t category, wire::SentReply reply) {
     if (category == 1) return;  // dropped
     if (category == 2) {
-      const wire::StringReply copy = reply;
-      reply("first");
-      return copy("second");
+      const wire::SentReply copy = reply;
+      reply("first", {{"httppost", {wire::Fate::dropped, wire::Reason::no_consent}}, {"uploadserver", {}}});
+      return copy("second", {});
     }
-    if (category == 3) return reply(std::string(1'200'000, 'x'));
+    if (category == 3) return reply(std::string(1'200'000, 'x'), {});
     held.push_back(std::move(reply));
     if (held.size() == 3) door.journal.add("held");
   };
@@ -63,18 +63,23 @@ TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   client.send(messageFrame(1, 1) + messageFrame(2, 2) + messageFrame(3, 3) + messageFrame(4, 4) +
               messageFrame(5, 4) + messageFrame(0, 4));
   EXPECT_EQ(client.next().results(), "The daemon gave no reply.");
-  EXPECT_EQ(client.next().results(), R"({"reply":"first"})");
+  EXPECT_EQ(client.next().results(),
+            R"({"outcomes":[{"backend":"httppost","outcome":"dropped","reason":"no_consent",)"
+            R"("text":"no consent to diagnostic submission"},)"
+            R"({"backend":"uploadserver","outcome":"none",)"
+            R"("reason":"takes_no_messages","text":"it takes none"}],)"
+            R"("reply":"first"})");
   const std::string tooLarge = client.next().description();
   EXPECT_THAT(tooLarge, HasSubstr("The reply of 12000"));
   EXPECT_THAT(tooLarge, HasSubstr("(1048576 bytes)"));
   ASSERT_TRUE(door.journal.waitFor("held"));
-  held[1](std::nullopt);
-  held[0]("late");
+  held[1](std::nullopt, {});
+  held[0]("late", {});
   EXPECT_FALSE(held[2]);  // no reply was wanted: nothing to call
-  EXPECT_EQ(client.next().results(), "{}");
+  EXPECT_EQ(client.next().results(), R"({"outcomes":[]})");
   const Received last = client.next();
   EXPECT_EQ(last.callID, 4u);
-  EXPECT_EQ(last.results(), R"({"reply":"late"})");
+  EXPECT_EQ(last.results(), R"({"outcomes":[],"reply":"late"})");
 }
 
 }  // namespace

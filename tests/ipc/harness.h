@@ -24,15 +24,15 @@ inline std::chrono::steady_clock::time_point within(std::chrono::milliseconds ti
 // Writes what comes into the journal; answers a message or leaves that to the test.
 class RecordingSession final : public AnsweringSession {
  public:
-  using OnMessage = std::function<void(std::uint16_t category, wire::StringReply)>;
+  using OnMessage = std::function<void(std::uint16_t category, wire::SentReply)>;
   RecordingSession(Journal& journal, OnMessage onMessage)
       : _journal(journal), _onMessage(std::move(onMessage)) {}
 
   void sendMessageWithCategory(std::uint16_t category, std::uint16_t type, wire::OptionalDictionary payload,
-                               wire::StringReply reply) override {
+                               wire::SentReply reply) override {
     _journal.add("sendMessage " + std::to_string(category) + " " + std::to_string(type) + " " +
                  (payload ? formats::writeJSON(*payload) : "none"));
-    _onMessage ? _onMessage(category, std::move(reply)) : reply("done");
+    _onMessage ? _onMessage(category, std::move(reply)) : reply("done", {});
   }
   void end() override { _journal.add("end"); }
 

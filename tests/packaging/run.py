@@ -167,15 +167,29 @@ with veltra.Session(client_type=7, client_name="phone", service_name="snake", re
 
     def test_an_entitlement_of_a_unit(self):
         """The daemon must see, in spite of its unit's restrictions, to which unit another user's process belongs."""
-        rules = self.box.path / "etc/veltrad/entitlements.plist"
+        rules = self.box.path / "etc/veltrad/entitlements.json"
         kept = rules.read_text()
-        rules.write_text(kept.replace("<key>uid</key><integer>0</integer>",
-                                      "<key>unit</key><string>sender.service</string>"))
+        rules.write_text(kept.replace('"uid": 0', '"unit": "sender.service"'))
         send = "veltractl send --client-type 7 --category 5 --type"
         assert "entitle" in self.box.run(f"{send} 80", check=False)
         self.box.run(f"systemd-run --wait --collect --unit=sender --uid=nobody {send} 81")
         self.received('"_status":81')
         rules.write_text(kept)
+
+    def test_an_adaptor(self):
+        """The daemon must load the bundle, and the bundle write its file, in spite of the unit's restrictions."""
+        document = (SOURCE / "docs/adaptor.md").read_text()
+        bundle = re.search(r"^(/System/\S+\.so)$", document, re.M)[1]
+        self.box.run(f"mkdir -p {Path(bundle).parent}\n"
+                     f"cc -shared -fPIC /usr/share/doc/libveltra-dev/examples/adaptor.c -o {bundle}\n"
+                     """sed -i 's/"release": {/"release": {"mivo": {},/' /var/lib/veltra-lab/storebags/quindle.json\n"""
+                     "systemctl restart veltrad\n"
+                     "veltractl send --client-type 7 --category 5 --type 84 codec=opus")
+        written = self.box.path / "var/log/veltrad/example-adaptor.jsonl"
+        wait_until(lambda: written.exists() and '{"method":5,"respCode":84,"dict":{"codec":"opus"}}' in written.read_text(),
+                   "a line of the adaptor")
+        self.received('"_status":84')
+        shutil.rmtree(self.box.path / "System")
 
     def test_upgrade_over_a_running_daemon(self):
         client = subprocess.Popen(self.box.command("exec veltractl session --client-type 7"), stdin=subprocess.PIPE,

@@ -22,18 +22,25 @@ AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters,
                              const std::string& name, const std::string& productFamily)
     : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
-std::optional<std::string> AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (const auto forbidden = prohibition()) {
+    _counters.count(wire::Reason::backend_disabled);
+    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+  }
   if (message.method == 0 || !message.payload || message.payload->empty()) {
-    _counters.count(message.method == 0 ? wire::Reason::energy_category_zero
-                                        : wire::Reason::energy_payload_empty);
-    return std::nullopt;
+    const wire::Reason why =
+        message.method == 0 ? wire::Reason::energy_category_zero : wire::Reason::energy_payload_empty;
+    _counters.count(why);
+    return {{wire::Fate::none, why}, std::nullopt};
   }
   Dictionary event = *message.payload;
   event.merge({{"event", unsigned{message.eventID}},
                {"method", unsigned{message.method}},
                {"respCode", unsigned{message.respCode}}});
-  _energyLog.logRegisteredEvent(kEnergyLogClient, kEnergyLogEvent, event);
-  return std::nullopt;
+  if (!_energyLog.logRegisteredEvent(kEnergyLogClient, kEnergyLogEvent, event)) {
+    return {{wire::Fate::dropped, wire::Reason::energy_log_failed}, std::nullopt};
+  }
+  return {{wire::Fate::written, wire::Reason::always}, std::nullopt};
 }
 
 }  // namespace veltrad::backends

@@ -16,7 +16,7 @@
 
 namespace veltrad::backends {
 
-void EnergyLog::logRegisteredEvent(std::uint32_t client, const std::string& name, const Dictionary& event) {
+bool EnergyLog::logRegisteredEvent(std::uint32_t client, const std::string& name, const Dictionary& event) {
   const Dictionary line{{"client", client},
                         {"name", name},
                         {"time", platform::timevalToSeconds(_clock.now())},
@@ -36,6 +36,7 @@ void EnergyLog::logRegisteredEvent(std::uint32_t client, const std::string& name
     logInfo("logRegisteredEvent: The energy log is written again after %llu lost events",
             static_cast<unsigned long long>(lostBefore));
   }
+  return !failure;
 }
 
 std::optional<std::string> EnergyLog::append(std::string_view line) const {

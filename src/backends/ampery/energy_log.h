@@ -23,8 +23,8 @@ class EnergyLog {
   EnergyLog(const platform::Clock& clock, platform::Counters& counters, std::string path)
       : _clock(clock), _counters(counters), _path(std::move(path)) {}
 
-  // An event that cannot be written is counted as lost. Consecutive failures make one error line.
-  void logRegisteredEvent(std::uint32_t client, const std::string& name, const Dictionary& event);
+  // False, and counted as lost, if the event cannot be written. Consecutive failures make one error line.
+  bool logRegisteredEvent(std::uint32_t client, const std::string& name, const Dictionary& event);
 
  private:
   // Returns why it failed, if it did.

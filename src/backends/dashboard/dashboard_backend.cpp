@@ -2,6 +2,7 @@
 // Connects a socket as a storebag's section says, and turns messages into datagrams.
 #include "backends/dashboard/dashboard_backend.h"
 
+#include <arpa/inet.h>
 #include <endian.h>
 
 #include <algorithm>
@@ -54,6 +55,10 @@ struct Server {
   bool reliable = true;
   std::chrono::milliseconds period = kDefaultPeriod;
 
+  std::string host() const {
+    char text[INET_ADDRSTRLEN] = {};
+    return inet_ntop(AF_INET, &address->sin_addr, text, sizeof text);
+  }
   DashboardQueues::Route routeOf(const platform::MemoryAccount* account) const {
     return {address->sin_addr.s_addr, address->sin_port, reliable, period, DashboardQueues::userOf(account)};
   }
@@ -72,6 +77,7 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
                                             const Server& server) {
   if (!server.address) {
     logError("DashboardBackend(initWithName): can't resolve server IP");
+    making.counters.count(wire::Reason::bad_address);
     return nullptr;
   }
   const bool reliable = server.reliable && useReliableUDP(socket);
@@ -85,7 +91,7 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period};
+  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, server.host(), making.gate};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
@@ -115,7 +121,10 @@ std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const Dashboard
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
     const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
     const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
-  if (profile && !namesServer(*profile)) return nullptr;
+  if (profile && !namesServer(*profile)) {
+    making.counters.count(wire::Reason::bad_address);
+    return nullptr;
+  }
   const Server server = serverOf(profile, serverIP, serverPort);
   auto queue =
       making.oneShot && server.address ? making.queues->join(server.routeOf(making.account.get())) : nullptr;
@@ -141,11 +150,23 @@ DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::str
       _usingProfile(profile != nullptr),
       _postURL(profile ? profile->postURL : std::nullopt) {}
 
+std::vector<std::string> DashboardBackend::hosts() const {
+  return {_networkProcQueue->host()};
+}
+
+void DashboardBackend::dropWaiting() {
+  _networkProcQueue->dropWaiting();
+}
+
 DashboardBackend::~DashboardBackend() {
   cleanup();
 }
 
-std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (const auto forbidden = prohibition()) {
+    _counters.count(wire::Reason::backend_disabled);
+    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+  }
   tagReportingPacket packet;
   packet.header = headerOf(message);
   PacketText text(packet.text);
@@ -155,8 +176,8 @@ std::optional<std::string> DashboardBackend::sendNumberedMessage(const NumberedM
   packet.header.invertedLength = htobe16(static_cast<std::uint16_t>(~length));
 
   std::string line = writeLocalLog(packet);
-  _networkProcQueue->tryToSendMsg({reinterpret_cast<const char*>(&packet), length}, message.eventID);
-  return line;
+  const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID), std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
@@ -182,6 +203,10 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
 }
 
 bool DashboardBackend::uploadLogData(const Array& logData) {
+  if (prohibition()) {
+    _counters.count(wire::Reason::log_data_refused_by_owner);
+    return false;
+  }
   const auto location = _uploads.upload(_postURL, logData);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};

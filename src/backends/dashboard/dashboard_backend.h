@@ -29,6 +29,7 @@ struct DashboardMaking {
   std::shared_ptr<DashboardQueues> queues;
   std::shared_ptr<platform::MemoryAccount> account;
   bool oneShot = false;
+  config::OwnerGate* gate = nullptr;
 };
 
 // The initialisers return null, after one error line, if the back end cannot work.
@@ -53,12 +54,15 @@ class DashboardBackend final : public VeltraBackend {
       const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
-  // Returns the dashboard text line of the message.
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  // The text is the dashboard text line of the message.
+  Sent sendNumberedMessage(const NumberedMessage& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
+  std::vector<std::string> hosts() const override;
 
  private:
+  void dropWaiting() override;
+
   DashboardBackend(const DashboardMaking& making, const std::string& name,
                    const config::DashboardProfile* profile, const std::string& productFamily);
 

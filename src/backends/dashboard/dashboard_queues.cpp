@@ -3,6 +3,7 @@
 #include "backends/dashboard/dashboard_queues.h"
 
 #include <algorithm>
+#include <vector>
 
 #include "backends/dashboard/network_proc_queue.h"
 
@@ -47,6 +48,18 @@ bool DashboardQueues::endOldest() {
   }
   if (leaves) leaves->end();
   return true;
+}
+
+void DashboardQueues::dropWaiting(const std::function<bool(const std::string& host)>& refuses) {
+  std::vector<std::shared_ptr<NetworkProcQueue>> queues;
+  {
+    const Lock held(_mutex);
+    for (const Lingering& one : _lingering) queues.push_back(one.queue.lock());
+    for (const auto& [route, queue] : _shared) queues.push_back(queue.lock());
+  }
+  for (const auto& queue : queues) {
+    if (queue && refuses(queue->host())) queue->dropWaiting();
+  }
 }
 
 // Removes the queue, and those that have ended. Takes no reference, because releasing the last one under the

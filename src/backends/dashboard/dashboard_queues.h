@@ -9,9 +9,11 @@
 #include <compare>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <list>
 #include <map>
 #include <memory>
+#include <string>
 
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
@@ -53,6 +55,8 @@ class DashboardQueues {
   void lingers(const std::shared_ptr<NetworkProcQueue>& queue, std::int64_t user);
   // Frees a descriptor. False if no queue lingers.
   bool endOldest();
+  // Drops what waits in queues that linger or are shared, if `refuses` says so of their host.
+  void dropWaiting(const std::function<bool(const std::string& host)>& refuses);
 
  private:
   struct Lingering {

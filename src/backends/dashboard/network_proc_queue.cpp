@@ -23,6 +23,20 @@ constexpr std::size_t kSocketBytes = 8192;
 DeliverySchedule::Time now() {
   return std::chrono::steady_clock::now();
 }
+
+// Of a first transmission that ended so.
+wire::Decision decisionOf(wire::Reason first, bool reliable) {
+  switch (first) {
+    case wire::Reason::datagram_sent:
+      return {reliable ? wire::Fate::waiting : wire::Fate::sent, wire::Reason::always};
+    case wire::Reason::datagram_held:
+      return {wire::Fate::waiting, first};
+    case wire::Reason::no_memory_to_await:
+      return {wire::Fate::sent, first};
+    default:
+      return {wire::Fate::dropped, first};
+  }
+}
 }  // namespace
 
 NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -34,7 +48,8 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _queues(std::move(queues)),
       _socket(std::move(socket)),
       _messageQueue(kind.reliableUDP, kind.shared,
-                    [this](std::string_view datagram) REQUIRES(_mutex) { return _socket.send(datagram); }),
+                    [this](std::string_view datagram)
+                        REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); }),
       _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
@@ -51,18 +66,28 @@ bool NetworkProcQueue::startReading(WorkPool& pool) {
   return _readSource != nullptr;
 }
 
-void NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
+wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
     _counters.count(wire::Reason::ended_before_sent);
-    return;
+    return {wire::Fate::dropped, wire::Reason::ended_before_sent};
+  }
+  // Its bytes are counted with each transmission.
+  if (!mayLeave(1, 0)) {
+    _counters.count(wire::Reason::datagram_over_daily_limit);
+    return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
   const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
+  return decisionOf(first.fate, _kind.reliableUDP);
+}
+
+bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
+  return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
 }
 
 // Batched events are dropped for a datagram that will wait for its acknowledgement, but not for one that
@@ -105,6 +130,12 @@ void NetworkProcQueue::end() {
   if (_backEnds > 0 || !_timer) return;
   giveUp(wire::Reason::too_many_linger);
   cleanupSources();
+}
+
+void NetworkProcQueue::dropWaiting() {
+  const Lock held(_mutex);
+  _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
+  _messageQueue.clear();
 }
 
 // `reason` applies to the datagrams that were sent.

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 #include <string_view>
 
 #include "backends/dashboard/delivery_schedule.h"
@@ -17,8 +18,10 @@
 #include "backends/dashboard/udp_socket.h"
 #include "backends/lock_ranks.h"
 #include "base/mutex.h"
+#include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/memory_budget.h"
+#include "wire/fates.h"
 
 namespace veltrad::backends {
 
@@ -38,6 +41,10 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     bool reliableUDP = false;
     bool shared = false;
     std::chrono::milliseconds period{};
+    // The dashboard's address, for those who ask whether it may be reached.
+    std::string host;
+    // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
+    config::OwnerGate* gate = nullptr;
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -49,7 +56,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // From now on acknowledgements are read. False if they cannot be.
   bool startReading(WorkPool& pool);
   // Called without a lock, because older data of the user may be dropped to make room.
-  void tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
+  wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
   // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
@@ -57,6 +64,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void cleanup();
   // Gives up what waits, to make room for other queues, unless a back end has joined.
   void end();
+  // Gives up what waits.
+  void dropWaiting();
+  const std::string& host() const { return _kind.host; }
   bool reliableUDP() const { return _kind.reliableUDP; }
 
  private:
@@ -67,6 +77,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
+  bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);

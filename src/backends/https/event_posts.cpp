@@ -15,8 +15,8 @@
 namespace veltrad::backends {
 
 namespace {
-wire::Reason reasonOf(http::HTTPError::Kind kind) {
-  switch (kind) {
+wire::Reason reasonOf(const http::HTTPError& error) {
+  switch (error.kind) {
     case http::HTTPError::Kind::transport:
     case http::HTTPError::Kind::tooLarge:
       return wire::Reason::post_failed;
@@ -26,6 +26,9 @@ wire::Reason reasonOf(http::HTTPError::Kind kind) {
       return wire::Reason::post_shortage;
     case http::HTTPError::Kind::stopping:
       return wire::Reason::post_stopped;
+    case http::HTTPError::Kind::refused:
+      return error.refusal == wire::Reason::over_daily_limit ? wire::Reason::over_daily_limit
+                                                             : wire::Reason::refused_by_owner;
   }
   return wire::Reason::post_failed;
 }
@@ -50,15 +53,17 @@ JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> e
   return makeJSONMessage(postTime, clientID, std::move(events), wantPretty);
 }
 
-void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
-                                 const std::optional<std::string>& url, Post post) {
+std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                                        const SessionFacts& facts,
+                                                        const std::optional<std::string>& url, Post post) {
   if (!url) {
     _counters.count(wire::Reason::post_url_nil, post.eventCount);
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
-    return;
+    return wire::Reason::post_url_nil;
   }
   http::HTTPRequest request =
       makePostRequest(facts, *url, std::move(post.json), post.eventMap, {_gzip, compressionLevel()});
+  request.events = post.eventCount;
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
@@ -73,7 +78,9 @@ void EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, 
   };
   if (const auto started = _http.start(std::move(request), answered); !started) {
     answered(Failure{started.error()});
+    return reasonOf(started.error());
   }
+  return std::nullopt;
 }
 
 int EventPosts::compressionLevel() {
@@ -81,11 +88,12 @@ int EventPosts::compressionLevel() {
   return (choices ? *choices : config::OperatorChoices()).compression.level;
 }
 
-void EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                            const VeltraBackend::FlushCompletion& completion) {
+wire::Reason EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
+                                    const VeltraBackend::FlushCompletion& completion) {
   const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
   auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount);
   if (completion) completion(std::nullopt, std::move(error));
+  return wire::Reason::too_many_posts;
 }
 
 std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& backEnd,
@@ -101,7 +109,7 @@ std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& back
   const int status = result.ok() ? result.value().status : result.error().status;
   const PostVerdict verdict = verdictOfStatus(status);
   const bool answered = result.ok() || verdict.disablesBackend;
-  _counters.count(answered ? verdict.reason : reasonOf(result.error().kind), eventCount);
+  _counters.count(answered ? verdict.reason : reasonOf(result.error()), eventCount);
   if (!verdict.disablesBackend) return error;
   const std::string text =
       fmt::sprintf("backend %s disabled by server %d return code", backEnd.name(), status);

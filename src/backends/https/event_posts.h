@@ -41,12 +41,14 @@ class EventPosts {
   void restrict(Dictionary& event) const;
   JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
                                              bool wantPretty) const;
-  // The post keeps the back end alive. A status of 5xx disables the back end.
-  void postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd, const SessionFacts& facts,
-                       const std::optional<std::string>& url, Post post);
-  // Counts the events as lost and calls `completion`, if there is one.
-  void refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                  const VeltraBackend::FlushCompletion& completion);
+  // The post keeps the back end alive. A status of 5xx disables the back end. Returns why the post has not
+  // begun, if it has not.
+  std::optional<wire::Reason> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                              const SessionFacts& facts,
+                                              const std::optional<std::string>& url, Post post);
+  // Counts the events as lost, under the reason that it returns, and calls `completion`, if there is one.
+  wire::Reason refusePost(VeltraBackend& backEnd, std::size_t eventCount,
+                          const VeltraBackend::FlushCompletion& completion);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
   // Frees what is kept from post to post.

@@ -30,6 +30,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
   if (!profile || !productFamily) return nullptr;
   if (!profile->clients) {
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
+    making.counters.count(wire::Reason::no_clients);
     return nullptr;
   }
   std::shared_ptr<HTTPSPostBackend> made(
@@ -57,17 +58,30 @@ void HTTPSPostBackend::updateState() {
   setState(_clientState.updateBackendState());
 }
 
+std::vector<std::string> HTTPSPostBackend::hosts() const {
+  std::vector<std::string> hosts;
+  for (const auto& url : {_clientState.links().postURL(), _clientState.links().realtimePostURL()}) {
+    if (url) hosts.push_back(http::hostName(*url));
+  }
+  return hosts;
+}
+
+void HTTPSPostBackend::dropWaiting() {
+  _counters.count(wire::Reason::refused_by_owner, _held->discard());
+}
+
 BackendActivity HTTPSPostBackend::activity() const {
   BackendActivity activity = VeltraBackend::activity();
   activity.held = _held->size();
   return activity;
 }
 
-std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
-  if (state() == kBackendDisabled) {
+Sent HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
+  if (const StateVerdict verdict = stateVerdict(); verdict.state == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
-    return std::nullopt;
+    return {{wire::Fate::dropped, verdict.reason}, std::nullopt};
   }
+  _counters.eventTaken();
   // Read before the facts, so that a change between the two is noticed.
   const std::uint64_t sessionIDChanges = _held->sessionIDChanges();
   const auto facts = this->facts();
@@ -86,7 +100,7 @@ std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedM
     }
   }
   Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
-  if (facts->userInfo) event.merge(*facts->userInfo);
+  if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   filterEvent(event);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
@@ -103,8 +117,8 @@ std::optional<std::string> HTTPSPostBackend::sendNumberedMessage(const NumberedM
   return postEvent(std::move(event), *facts, message);
 }
 
-std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
-                                                       const NumberedMessage& message) {
+Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
+                                 const NumberedMessage& message) {
   const bool realtime = meansRealtime(message.flag);
   std::optional<std::string> flushed;
   if (realtime && !_held->empty()) {
@@ -122,8 +136,7 @@ std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, const S
     charge = facts.account->tryCharge(sizeOfEvent(event).charged, platform::MemoryUse::kept);
   }
   if (!charge) {
-    _posts.refusePost(*this, 1, nullptr);
-    return flushed;
+    return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
   }
   std::vector<Dictionary> events;
   events.push_back(std::move(event));
@@ -133,10 +146,13 @@ std::optional<std::string> HTTPSPostBackend::postEvent(Dictionary event, const S
     result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + result.value_or("(null)");
   }
   const PostLinks& links = _clientState.links();
-  _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
-                         {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
-                          std::move(*charge), 0, nullptr});
-  return result;
+  const wire::Reason why = stateVerdict().reason;  // before an answer can change it
+  const auto refused =
+      _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
+                             {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
+                              std::move(*charge), 0, nullptr});
+  if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
+  return {{wire::Fate::posted, why}, std::move(result)};
 }
 
 Dictionary HTTPSPostBackend::withStopFields(const Dictionary& payload, bool batching) const {
@@ -157,8 +173,8 @@ void HTTPSPostBackend::filterEvent(Dictionary& event) const {
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
-std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
-                                                        std::uint64_t sessionIDChanges) {
+Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
+                                  std::uint64_t sessionIDChanges) {
   // User info and filters may have changed the event's method.
   const std::int32_t method = event.int32("_method").value_or(0);
   // Removes these fields now, so that they take no memory until the flush.
@@ -176,8 +192,12 @@ std::optional<std::string> HTTPSPostBackend::batchEvent(Dictionary event, platfo
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  _counters.count(keep(std::move(event), size, method, account, sessionIDChanges));
-  return flushed;
+  const wire::Reason kept = keep(std::move(event), size, method, account, sessionIDChanges);
+  _counters.count(kept);
+  if (kept != wire::Reason::event_batched) return {{wire::Fate::dropped, kept}, std::move(flushed)};
+  const StateVerdict verdict = stateVerdict();
+  const bool reports = verdict.state == kBackendReporting;
+  return {{reports ? wire::Fate::batched : wire::Fate::held, verdict.reason}, std::move(flushed)};
 }
 
 // Drops events of the user's other batches if necessary.
@@ -200,8 +220,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     return std::nullopt;
   }
   const auto facts = this->facts();
-  const SharedDictionary& userInfo = facts->userInfo;
-  if (facts->requireUserInfo && !userInfo) {
+  if (facts->requireUserInfo && !facts->userInfo) {
     if (completion)
       completion(std::nullopt, wire::makeReportingError("Can not flush: userInfo is required", -1));
     return std::nullopt;
@@ -209,8 +228,8 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
-  if (userInfo) {
-    Dictionary filtered = *userInfo;
+  if (const SharedDictionary& sent = facts->sentUserInfo) {
+    Dictionary filtered = *sent;
     filterEvent(filtered);
     const std::size_t more = count * sizeOfEvent(filtered).charged;
     if (facts->account && !facts->account->keepMore(taken.charge, more)) {

@@ -35,23 +35,25 @@ class HTTPSPostBackend final : public VeltraBackend {
       const std::optional<std::string>& productFamily);
 
   void updateState() override;
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(const NumberedMessage& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
   BackendActivity activity() const override;
+  std::vector<std::string> hosts() const override;
+  bool hostsAreFixed() const override { return false; }
 
  private:
+  void dropWaiting() override;
+
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
                    std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
   Dictionary withStopFields(const Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;
-  std::optional<std::string> batchEvent(Dictionary event, platform::MemoryAccount* account,
-                                        std::uint64_t sessionIDChanges);
+  Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
-  std::optional<std::string> postEvent(Dictionary event, const SessionFacts& facts,
-                                       const NumberedMessage& message);
+  Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message);
   JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const;
 
   platform::Locale& _locale;

@@ -34,7 +34,11 @@ StateVerdict HTTPSPostState::updateBackendState() {
   if (!facts->requireUserInfo) return reportForEveryone();
   if (!userInfo) return counted(kBackendWaiting, wire::Reason::waits_for_user_info);
   if (!found) return counted(kBackendDisabled, wire::Reason::no_entry);
-  return reportForClient(*entry, clientName, serviceName);
+  // For log lines alone.
+  const SharedDictionary& shown = facts->sentUserInfo;
+  return reportForClient(*entry,
+                         optionalText(shown ? shown->string(wire::kVeltraUserInfoClientName) : nullptr),
+                         optionalText(shown ? shown->string(wire::kVeltraUserInfoServiceName) : nullptr));
 }
 
 StateVerdict HTTPSPostState::reportForEveryone() {

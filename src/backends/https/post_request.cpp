@@ -29,7 +29,7 @@ http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, st
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
 
   auto& headers = request.headers;
-  if (const SharedDictionary& userInfo = facts.userInfo) {
+  if (const SharedDictionary& userInfo = facts.sentUserInfo) {
     if (const std::string* name = userInfo->string(wire::kVeltraUserInfoClientName)) {
       headers.emplace_back("X-VLT-Client-Name", *name);
     }

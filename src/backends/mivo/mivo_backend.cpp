@@ -15,6 +15,7 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platf
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
+    counters.count(wire::Reason::client_type_not_served);
     return nullptr;
   }
   backend->loadAdaptor();
@@ -36,21 +37,30 @@ void MivoBackend::loadAdaptor() {
   if (!_mivoAdaptor) logWarning("MivoBackend(initWithName): no Mivo adaptor: %s", failure.c_str());
 }
 
-std::optional<std::string> MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
+  if (const auto forbidden = prohibition()) {
+    _counters.count(wire::Reason::backend_disabled);
+    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+  }
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
-    _counters.count(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
-    return std::nullopt;
+    return dropped(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
   }
   const auto thrown =
       _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode, message.payload);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
+    return dropped(wire::Reason::adaptor_threw);
   }
-  _counters.count(thrown ? wire::Reason::adaptor_threw : wire::Reason::handed_to_adaptor);
-  return std::nullopt;
+  _counters.count(wire::Reason::handed_to_adaptor);
+  return {{wire::Fate::delivered, wire::Reason::always}, std::nullopt};
+}
+
+Sent MivoBackend::dropped(wire::Reason why) const {
+  _counters.count(why);
+  return {{wire::Fate::dropped, why}, std::nullopt};
 }
 
 }  // namespace veltrad::backends

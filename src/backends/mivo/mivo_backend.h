@@ -25,12 +25,13 @@ class MivoBackend final : public VeltraBackend {
   static bool isClientTypeAllowed(std::int32_t clientType) { return isAdaptorClientType(clientType); }
 
   // Passes on the payload, the method and the response code. Returns no text.
-  std::optional<std::string> sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(const NumberedMessage& message) override;
 
  private:
   MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
               const std::string& name, const std::string& productFamily);
   void loadAdaptor();
+  Sent dropped(wire::Reason why) const;
 
   platform::Counters& _counters;
   CodeBundle& _clientBundle;

@@ -37,6 +37,8 @@ wire::Reason fateAfter(http::HTTPError::Kind kind) {
       return wire::Reason::file_shortage;
     case http::HTTPError::Kind::stopping:
       return wire::Reason::file_stopped;
+    case http::HTTPError::Kind::refused:
+      return wire::Reason::file_refused_by_owner;
   }
   return wire::Reason::file_exchange_failed;
 }
@@ -53,6 +55,7 @@ std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& m
                                                            const std::string& productFamily) {
   if (!profile || !profile->postURL) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
+    making.counters.count(wire::Reason::no_post_url);
     return nullptr;
   }
   std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile->postURL, productFamily));
@@ -72,6 +75,12 @@ UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
+  if (prohibition()) {
+    logError("UploadBackend(uploadFileAtPath): File %s stays: the owner of the device does not let it leave",
+             path.c_str());
+    _counters.count(wire::Reason::file_refused_by_owner);
+    return false;
+  }
   const auto lent = _lentFiles.consume(extensionToken);
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;

@@ -41,6 +41,7 @@ class UploadBackend final : public VeltraBackend {
   // True if the request was made, whatever the result: only the answer decides whether the client is asked to
   // remove its file. Otherwise an error line says why not.
   bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
+  std::vector<std::string> hosts() const override { return {http::hostName(_uploadURL)}; }
 
  private:
   UploadBackend(const UploadMaking& making, const std::string& name, const std::string& uploadURL,

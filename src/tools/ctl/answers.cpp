@@ -5,8 +5,13 @@
 #include <fmt/format.h>
 
 #include "formats/json.h"
+#include "wire/fates.h"
+#include "wire/names.h"
 
 namespace veltrad::ctl {
+
+namespace key = wire::key;
+
 namespace {
 
 std::string quoted(std::string_view text) {
@@ -22,6 +27,19 @@ std::string formatError(const std::optional<wire::ReportingError>& error) {
   if (!error) return "null";
   return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", quoted(error->domain), error->code,
                      quoted(error->description));
+}
+
+std::string textIn(const Dictionary& outcome, const char* name) {
+  const std::string* text = outcome.string(name);
+  return text ? *text : std::string();
+}
+
+template <typename Use>
+void forEachOutcome(const Answer& answer, Use use) {
+  if (!answer.outcomes) return;
+  for (const Value& outcome : *answer.outcomes) {
+    if (const Dictionary* dictionary = outcome.asDictionary()) use(*dictionary);
+  }
 }
 
 }  // namespace
@@ -58,6 +76,33 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
   const bool alwaysWithError = operation == Operation::flush || operation == Operation::uploadLogData;
   if (alwaysWithError || answer.status != VELTRA_OK) text += ",\"error\":" + formatError(answer.error);
   return text + '}';
+}
+
+std::string formatSent(const Answer& answer) {
+  std::string text = formatAnswer(Operation::send, answer);
+  text.pop_back();
+  return text + ",\"outcomes\":" + orNull(answer.outcomes) + '}';
+}
+
+std::vector<std::string> outcomeLines(const Answer& answer) {
+  std::vector<std::string> lines;
+  forEachOutcome(answer, [&](const Dictionary& outcome) {
+    lines.push_back(fmt::format("{}: {}: {} ({})", textIn(outcome, key::kBackend),
+                                textIn(outcome, key::kOutcome), textIn(outcome, key::kText),
+                                textIn(outcome, key::kReason)));
+  });
+  return lines;
+}
+
+bool reported(const Answer& answer) {
+  constexpr wire::Fate kReported[] = {wire::Fate::batched, wire::Fate::posted,  wire::Fate::waiting,
+                                      wire::Fate::sent,    wire::Fate::written, wire::Fate::delivered};
+  bool found = false;
+  forEachOutcome(answer, [&](const Dictionary& outcome) {
+    const std::string fate = textIn(outcome, key::kOutcome);
+    for (const wire::Fate one : kReported) found |= fate == wire::nameOf(one);
+  });
+  return found;
 }
 
 std::string formatAggregated(const AggregatedCopy& copy) {

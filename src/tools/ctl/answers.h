@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/value.h"
 #include "tools/ctl/operation.h"
@@ -19,6 +20,7 @@ struct Answer {
   veltra_status status = VELTRA_OK;
   std::optional<std::string> reply;
   std::optional<Array> backends;  // names
+  std::optional<Array> outcomes;  // as veltra_reply_outcomes()
   std::optional<wire::ReportingError> error;
   bool uploaded = false;
   // The uploaded file was removed.
@@ -41,6 +43,12 @@ Answer answerOfFailure(veltra_status status);
 // JSON without a line break, "op" first. Answers to a flush and to uploaded log data always have "error";
 // others have it only if the call ended without an answer.
 std::string formatAnswer(Operation operation, const Answer& answer);
+// The same for one message, with "outcomes".
+std::string formatSent(const Answer& answer);
+// For people: "httppost: dropped: no consent to diagnostic submission (no_consent)", one for each back end.
+std::vector<std::string> outcomeLines(const Answer& answer);
+// Whether a back end reports the message, or will.
+bool reported(const Answer& answer);
 // {"op":"aggregated","sessionInfo":…,"timestamp":…,"category":…,"type":…,"payload":…}; null where absent.
 std::string formatAggregated(const AggregatedCopy& copy);
 // {"op":"error","line":N,"description":"…"}; N starts at 1.

@@ -14,6 +14,8 @@ namespace veltrad::ctl {
 namespace {
 
 constexpr std::chrono::milliseconds kProgressInterval{500};
+// A daemon that is restarted comes back within this time.
+constexpr std::chrono::seconds kLongestLoss{5};
 
 // Null for no dictionary.
 client::ValuePointer nodeOf(const std::optional<Dictionary>& dictionary) {
@@ -33,6 +35,9 @@ Answer answerOf(const veltra_reply* reply) {
   if (const char* text = veltra_reply_text(reply, &length)) answer.reply.emplace(text, length);
   if (const veltra_value* backends = veltra_reply_backends(reply)) {
     answer.backends = client::valueOfNode(*backends).takeArray();
+  }
+  if (const veltra_value* outcomes = veltra_reply_outcomes(reply)) {
+    answer.outcomes = client::valueOfNode(*outcomes).takeArray();
   }
   answer.uploaded = veltra_reply_uploaded(reply);
   answer.removed = veltra_reply_removed(reply);
@@ -91,6 +96,8 @@ std::optional<std::string> ClientSession::create(veltra_session_options& options
                                                  const std::optional<std::string>& root) {
   if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
   options.root = root ? root->c_str() : nullptr;
+  options.state_changed = &ClientSession::stateChanged;
+  options.state_context = this;
   veltra_status status = VELTRA_OK;
   char* error = nullptr;
   _session = veltra_session_create(&options, &status, &error);
@@ -176,10 +183,11 @@ std::optional<Answer> ClientSession::await(const Call& call, const Progress& pro
   const veltra_status status = call(_session, &ClientSession::answered, this);
   if (status != VELTRA_OK) return answerOfFailure(status);
   const auto begin = std::chrono::steady_clock::now();
-  const auto interval = progress ? std::optional(kProgressInterval) : std::nullopt;
   auto wake = Interrupt::Wake::timeout;
-  while ((wake = _interrupt.wait(_arrived.get(), interval)) == Interrupt::Wake::timeout) {
-    progress(std::chrono::duration_cast<std::chrono::seconds>(std::chrono::steady_clock::now() - begin));
+  while ((wake = _interrupt.wait(_arrived.get(), kProgressInterval)) == Interrupt::Wake::timeout) {
+    if (lostForLong()) return answerOfFailure(VELTRA_NO_DAEMON);
+    if (progress)
+      progress(std::chrono::duration_cast<std::chrono::seconds>(std::chrono::steady_clock::now() - begin));
   }
   if (progress) progress(std::nullopt);
   if (wake == Interrupt::Wake::interrupted) return std::nullopt;
@@ -187,6 +195,19 @@ std::optional<Answer> ClientSession::await(const Call& call, const Progress& pro
   eventfd_read(_arrived.get(), &arrived);
   Lock lock(_mutex);
   return std::exchange(_answer, std::nullopt);
+}
+
+bool ClientSession::lostForLong() {
+  Lock lock(_mutex);
+  return _lost && std::chrono::steady_clock::now() - *_lost > kLongestLoss;
+}
+
+void ClientSession::stateChanged(void* context, veltra_connection_state state, const veltra_value*,
+                                 const char*) {
+  auto& self = *static_cast<ClientSession*>(context);
+  Lock lock(self._mutex);
+  if (state == VELTRA_STATE_LOST) self._lost = std::chrono::steady_clock::now();
+  if (state == VELTRA_STATE_CONNECTED) self._lost.reset();
 }
 
 void ClientSession::answered(void* context, const veltra_reply* reply) {

@@ -55,6 +55,9 @@ class ClientSession {
   std::optional<std::string> create(veltra_session_options& options, const std::optional<std::string>& root);
   std::optional<Answer> await(const Call& call, const Progress& progress = nullptr);
   // Called on the library's thread.
+  bool lostForLong();
+  static void stateChanged(void* context, veltra_connection_state state, const veltra_value* backends,
+                           const char* why);
   static void answered(void* context, const veltra_reply* reply);
   static void aggregated(void* context, const veltra_value* sessionInfo, double timestamp,
                          std::uint16_t category, std::uint16_t type, const veltra_value* payload);
@@ -65,6 +68,8 @@ class ClientSession {
   veltra_session* _session = nullptr;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<Answer> _answer GUARDED_BY(_mutex);
+  // Since when there is no connection; absent if there is one.
+  std::optional<std::chrono::steady_clock::time_point> _lost GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::ctl

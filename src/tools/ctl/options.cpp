@@ -42,6 +42,11 @@ std::string textProblem(const std::string& text) {
   return isUTF8(text) ? std::string() : fmt::format("\"{}\": expected UTF-8", escapedForLog(text));
 }
 
+std::string flagProblem(const std::string& text) {
+  if (text.size() == 1 && text[0] >= '0' && text[0] <= '3') return {};
+  return fmt::format("expected an integer from 0 to 3, found \"{}\"", escapedForLog(text));
+}
+
 // A decimal number in the range of T.
 template <typename T, typename Target>
 CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, const std::string& help) {
@@ -156,8 +161,21 @@ void addSend(CLI::App& app, Options& options, Texts& texts) {
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
   addMessage(*send, options, texts);
   addNumber<std::uint32_t>(*send, "--flag", options.flag,
-                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither");
-  send->footer("Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
+                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither")
+      ->check(CLI::Validator(flagProblem, ""));
+  send->add_option_function<std::string>(
+          "--expect", [&options](const std::string&) { options.expectReported = true; },
+          "reported: exit with status 1 unless a back end reports the message")
+      ->type_name("WHAT")
+      ->check(CLI::Validator(
+          [](const std::string& text) {
+            return text == "reported" ? std::string()
+                                      : fmt::format("expected reported, found \"{}\"", escapedForLog(text));
+          },
+          ""));
+  send->footer(
+      "Says on standard error what each back end has done with the message, and why.\n\n"
+      "Example:\n  veltractl send --client-type 7 --category 5 --type 1 codec=opus seconds=12.5");
 }
 
 void addOneShot(CLI::App& app, Options& options, Texts& texts) {

@@ -57,7 +57,7 @@ struct Care {
   bool yes = false;
 };
 
-// The command's options and arguments, by name.
+// Its 13 fields are the command's options and arguments, by name.
 struct Options {
   Command command = Command::session;
   std::optional<std::string> root;
@@ -69,6 +69,8 @@ struct Options {
   std::uint16_t type = 0;
   std::uint32_t flag = 0;
   std::optional<Dictionary> payload;
+  // send: it has failed unless a back end reports the message.
+  bool expectReported = false;
   std::string file;
   Care care;
 };

@@ -20,6 +20,11 @@ bool printLine(std::string_view line) {
   return false;
 }
 
+void remark(std::string_view line) {
+  fmt::print(stderr, "{}\n", line);
+  std::fflush(stderr);
+}
+
 void complain(std::string_view text) {
   fmt::print(stderr, "veltractl: {}\n", text);
   std::fflush(stderr);

@@ -8,6 +8,8 @@ namespace veltrad::ctl {
 
 // Prints and flushes one line. False, after an error message, if that fails.
 [[nodiscard]] bool printLine(std::string_view line);
+// Prints one line on standard error.
+void remark(std::string_view line);
 // Prints "veltractl: …" on standard error.
 void complain(std::string_view text);
 

@@ -60,9 +60,20 @@ int failed(const std::optional<Answer>& answer) {
   return 1;
 }
 
+int finishSend(const Options& options, const Answer& answer) {
+  if (!printLine(formatSent(answer))) return 1;
+  if (answer.status != VELTRA_OK) return failed(answer);
+  for (const std::string& line : outcomeLines(answer)) remark(line);
+  if (!options.expectReported || reported(answer)) return 0;
+  complain(answer.outcomes ? "No back end reports the message."
+                           : "The daemon is too old to say whether a back end reports the message.");
+  return 1;
+}
+
 int finish(const Options& options, const Called& called) {
   const auto& [operation, answer] = called;
   if (!answer) return failed(answer);
+  if (operation == Operation::send) return finishSend(options, *answer);
   if (!printLine(formatAnswer(operation, *answer))) return 1;
   if (answer->status != VELTRA_OK) return failed(answer);
   if (operation == Operation::uploadFile) return reportUpload(options.file, *answer) ? 0 : 1;

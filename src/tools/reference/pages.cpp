@@ -9,6 +9,7 @@
 #include <optional>
 
 #include "config/operator_settings.h"
+#include "config/policy.h"
 #include "config/storebag_content.h"
 #include "storebag/options.h"
 #include "tools/ctl/options.h"
@@ -42,6 +43,7 @@ constexpr Part kParts[] = {
     {"options of veltra-lab", [] { return optionsOf(lab::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
     {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},
+    {"keys of the policy", [] { return keysOf(config::PolicyRules::kKeys, kNotYet); }},
     {"preferences", preferences},
     {"client types", clientTypes},
     {"environments", environments},

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Sends numbered messages until its input ends, then prints what became of them as one line of JSON.
-// Usage: sender NAME MICROSECONDS (between two messages) post|reply (asks for no answers, or for all)
+// Usage: sender NAME MICROSECONDS (between two messages, on average) post|reply (asks for no answers, or for
+// all)
 #include <poll.h>
 #include <unistd.h>
 
@@ -17,6 +18,7 @@
 namespace {
 
 using Clock = std::chrono::steady_clock;
+constexpr unsigned kBurst = 16;
 
 bool inputEnded() {
   pollfd input{STDIN_FILENO, POLLIN, 0};
@@ -38,6 +40,7 @@ int main(int count, char** arguments) {
   veltra::Session session{{.clientType = 7,
                            .clientName = name,
                            .serviceName = "ringer",
+                           .requireUserInfo = true,
                            .batchEvents = true,
                            .connectLater = true}};
   if (!session) {
@@ -49,7 +52,7 @@ int main(int count, char** arguments) {
   session.start(veltra::Callback());
   unsigned long sent = 0, refused = 0;
   Clock::duration longest{}, all{};
-  for (unsigned long round = 0; round % 64 != 0 || !inputEnded(); ++round) {
+  for (unsigned long round = 0; round % kBurst != 0 || !inputEnded(); ++round) {
     const veltra::Dictionary payload{{"sender", name}, {"number", static_cast<std::uint64_t>(sent)}};
     const auto begin = Clock::now();
     const veltra_status status =
@@ -58,11 +61,12 @@ int main(int count, char** arguments) {
     all += taken;
     longest = std::max(longest, taken);
     ++(status == VELTRA_OK ? sent : refused);
-    if (round == 64) {
+    if (round == kBurst) {
       std::puts("sending");
       std::fflush(stdout);
     }
-    if (pause.count() > 0) std::this_thread::sleep_for(pause);
+    // In bursts, so that some are under way when the daemon goes.
+    if (pause.count() > 0 && round % kBurst == 0) std::this_thread::sleep_for(kBurst * pause);
   }
   const auto lost = session.counter(VELTRA_COUNTER_LOST);
   const auto connections = session.counter(VELTRA_COUNTER_CONNECTIONS);

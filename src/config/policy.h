@@ -1,0 +1,80 @@
+// SPDX-License-Identifier: Apache-2.0
+// What the owner of the device lets leave it, as etc/veltrad/policy.json says. Values to verdicts; any
+// thread.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "config/key_table.h"
+#include "wire/reasons.h"
+
+namespace veltrad::platform {
+struct LocalContent;
+}  // namespace veltrad::platform
+
+namespace veltrad::config {
+
+enum class Reporting { on, off };
+void take(const Key& key, const Value& value, Reporting& field);
+
+// Whether a storebag may report without the user's consent.
+enum class ConsentRule { storebag, always };
+void take(const Key& key, const Value& value, ConsentRule& field);
+
+// "history": what left is kept for the owner to read.
+struct HistoryBounds {
+  std::int32_t days = 7;
+  std::optional<std::int64_t> bytes = 67'108'864;
+
+  bool operator==(const HistoryBounds&) const = default;
+  static const KeyTable kKeys;
+};
+void take(const Key& key, const Value& value, std::optional<HistoryBounds>& field);
+
+// What holds without the file stands here.
+struct PolicyRules {
+  Reporting reporting = Reporting::on;
+  ConsentRule consent = ConsentRule::storebag;
+  TextList backends;  // not given: all
+  TextList hosts;     // not given: all
+  TextList remove;
+  TextList hash;
+  std::optional<std::int64_t> dailyEvents;
+  std::optional<std::int64_t> dailyBytes;
+  std::optional<HistoryBounds> history;
+
+  bool operator==(const PolicyRules&) const = default;
+  static const KeyTable kKeys;
+};
+
+// Immutable. Each verdict can only narrow what a storebag lets out.
+class Policy {
+ public:
+  // Without limits.
+  Policy() = default;
+  explicit Policy(PolicyRules rules) : _rules(std::move(rules)) {}
+  // Nothing leaves: the file is broken, or could not be read yet.
+  static std::shared_ptr<const Policy> closed();
+  // Nothing: the file is broken, and `error` says where: "PATH:LINE:COLUMN: text". An unknown key or a value
+  // of a wrong type breaks it; a back end of an unknown name does not. `content` is good.
+  static std::shared_ptr<const Policy> of(const platform::LocalContent& content, std::string& error);
+
+  const PolicyRules& rules() const { return _rules; }
+  // Why no back end reports: policy_broken, policy_reporting, policy_consent; nothing: each may.
+  std::optional<wire::Reason> refusal(bool consent) const;
+  // Whether a back end of this name is made.
+  bool makes(std::string_view backend) const;
+  // Whether a server may be contacted. `host`: as an address has it, in letters of any case, an IPv6 address
+  // with or without brackets. "*.example.com" in the policy means the names below example.com.
+  bool reaches(std::string_view host) const;
+
+ private:
+  PolicyRules _rules;
+  bool _broken = false;
+};
+
+}  // namespace veltrad::config

@@ -1,0 +1,50 @@
+// SPDX-License-Identifier: Apache-2.0
+// Asks the gate. HTTP thread.
+#include "http/gatekeeper.h"
+
+#include <map>
+#include <string>
+#include <utility>
+
+namespace veltrad::http {
+
+namespace {
+std::optional<HTTPError> asError(std::optional<RequestRefusal> refused) {
+  if (!refused) return std::nullopt;
+  HTTPError error{HTTPError::Kind::refused, std::move(refused->text)};
+  error.refusal = refused->reason;
+  return error;
+}
+}  // namespace
+
+std::optional<HTTPError> Gatekeeper::refusalOf(const CurlTransfer& transfer) const {
+  if (_gate == nullptr) return std::nullopt;
+  return asError(_gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName()));
+}
+
+// Once for each request, also if it begins anew on another connection.
+std::optional<HTTPError> Gatekeeper::overLimit(CurlTransfer& transfer) const {
+  if (_gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag || !transfer.beginsFirst())
+    return std::nullopt;
+  return asError(_gate->count(transfer.events(), transfer.bodySize()));
+}
+
+// The gate is not asked under the queue's lock, so the hosts are collected first.
+HTTPQueue::Transfers Gatekeeper::takeRefused(HTTPQueue& queue) const {
+  using Key = std::pair<bool, std::string>;
+  const auto keyOf = [](const CurlTransfer& transfer) {
+    return Key(transfer.lane() == HTTPRequest::Lane::storebag, transfer.host());
+  };
+  std::map<Key, bool> refused;
+  queue.take([&](const CurlTransfer& transfer) {
+    refused.try_emplace(keyOf(transfer), false);
+    return false;
+  });
+  for (auto& [key, is] : refused) is = _gate && _gate->refusal(key.first, hostName("https://" + key.second));
+  return queue.take([&](const CurlTransfer& transfer) {
+    const auto found = refused.find(keyOf(transfer));
+    return found != refused.end() && found->second;
+  });
+}
+
+}  // namespace veltrad::http

@@ -1,0 +1,21 @@
+// SPDX-License-Identifier: Apache-2.0
+// Asks libcurl's parser of URLs. Any thread.
+#include "http/host_name.h"
+
+#include <curl/curl.h>
+
+#include <memory>
+
+namespace veltrad::http {
+
+std::string hostName(const std::string& url) {
+  const std::unique_ptr<CURLU, decltype(&curl_url_cleanup)> parsed(curl_url(), curl_url_cleanup);
+  char* host = nullptr;
+  if (!parsed || curl_url_set(parsed.get(), CURLUPART_URL, url.c_str(), 0) != CURLUE_OK ||
+      curl_url_get(parsed.get(), CURLUPART_HOST, &host, CURLU_URLDECODE) != CURLUE_OK)
+    return "";
+  const std::unique_ptr<char, decltype(&curl_free)> owned(host, curl_free);
+  return host;
+}
+
+}  // namespace veltrad::http

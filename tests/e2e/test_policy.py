@@ -1,0 +1,151 @@
+# SPDX-License-Identifier: Apache-2.0
+"""What the owner of the device says in policy.json, on open sessions and before anything leaves."""
+import hmac
+import json
+import time
+
+from harness import wait_until
+from test_https import HTTPSTest, entry
+
+POLICY = "etc/veltrad/policy.json"
+DAEMON_LINE = "hearOwner: The owner's word has changed: "
+UPLOAD_LOG = "uploadLogData:completionHandler:"
+BACKENDS = ["ampery", "dashboard", "httppost", "uploadserver"]
+WHO = {"clientName": "phone", "serviceName": "phone"}
+
+
+class Policy(HTTPSTest):
+    def setUp(self):
+        super().setUp()
+        for name in ("quindle", "ostvane"):
+            self.everything(name)
+
+    def everything(self, name, *entries, reliable=250):
+        """A storebag with each kind of back end that a test can watch."""
+        self.lab.put(name, {"version": "v", "release": {
+            "httppost": {"clients": list(entries) or [entry(client=None, override_dnu=1)]},
+            "dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}", "post_url": "${url}/logdata", "reliable": reliable},
+            "uploadserver": {"post_url": "${url}/upload"}, "ampery": {}}})
+
+    def say(self, **rules):
+        self.root.write(POLICY, b"// as the owner writes it\n" + json.dumps(rules).encode())
+
+    def forget(self):
+        (self.root.path / POLICY).unlink()
+
+    def arrived(self):
+        return [len(self.lab.received(kind)) for kind in ("events", "dashboard", "uploads", "logdata")]
+
+    def test_reporting_off_stops_open_sessions_within_a_second_and_on_lets_them_go_on(self):
+        self.lab.control(path="/dashboard", ack="drop")
+        with self.serving() as daemon:
+            session = self.client(batchEvent=True)
+            session.message(number=1)
+            self.lab.received("dashboard", 2)
+            self.say(reporting="off")
+            began = time.monotonic()
+            daemon.wait_for_line(DAEMON_LINE + "policy_reporting")
+            wait_until(lambda: self.stats().get("datagram dropped: the owner of the device does not let it leave"),
+                       "datagrams dropped")
+            self.assertLess(time.monotonic() - began, 1)
+            before = self.arrived()
+            self.assertEqual(session.states(**WHO), [])
+            session.message(number=2)
+            session.flush()
+            self.assertEqual(self.client().backends, [])
+            self.assertEqual(self.arrived(), before)
+            self.say(reporting="on")
+            wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends again")
+            session.message(number=3)
+            session.flush()
+            self.lab.wait_for_events(1, number=3)
+            self.assertEqual([event["number"] for event in self.lab.events() if "number" in event], [3])
+        self.assertGreaterEqual(self.counts()["event dropped: the owner of the device does not let it leave"], 2)
+
+    def test_consent_always_holds_against_storebag_and_client(self):
+        self.say(consent="always")
+        self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+        with self.serving("without requiring it", "stays: the owner", "upload failed") as daemon:
+            for required in (False, True):
+                session = self.client(requireUserInfo=required)
+                self.assertEqual(session.backends, [])
+                session.message(number=1)
+                session.flush()
+            self.ctl("upload", "--client-type", "7", "--session-id", "9", str(self.root.path / "etc/veltrad/device.plist"), status=1)
+            self.assertEqual(self.arrived(), [0, 0, 0, 0])
+            self.root.prefer(DiagnosticLogSubmissionEnabled=True)
+            daemon.wait_for_line(DAEMON_LINE + "back ends may report")
+            wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends")
+            session.message(number=2)
+            self.lab.wait_for_events(1, number=2)
+
+    def test_back_ends_and_hosts_that_are_not_listed_are_not_made_or_reached(self):
+        with self.serving("Unable to fetch storebag", "No storebag", "Could not fetch") as daemon:
+            self.say(backends=["httppost", "later"])
+            daemon.wait_for_line(DAEMON_LINE, 1)
+            self.assertEqual(self.client().backends, ["httppost"])
+            self.say(hosts=["LOCALHOST"])
+            daemon.wait_for_line(DAEMON_LINE, 2)
+            session = self.client()
+            self.assertEqual(session.backends, ["ampery", "httppost", "uploadserver"])  # the dashboard is 127.0.0.1
+            self.say(hosts=["*.example"])
+            daemon.wait_for_line(DAEMON_LINE, 3)
+            wait_until(lambda: session.states(**WHO) == ["ampery"], "back ends without a host")
+            before, asked = self.arrived(), len(self.lab.received("storebags"))
+            session.message(number=1)
+            self.assertIsNone(self.client(client_type=6).backends)
+            self.assertEqual((self.arrived(), len(self.lab.received("storebags"))), (before, asked))
+
+    def test_fields_are_taken_out_of_everything_and_hashed_everywhere(self):
+        self.root.prefer(forceEventLogging=True, environmentType=1)
+        self.lab.put("quindle", {"version": "v", "development": {
+            "httppost": {"clients": [entry()]}, "ampery": {},
+            "dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}", "post_url": "${url}/logdata"}}})
+        self.say(remove=["SECRET", "serviceName"], hash=["number"])
+        with self.serving("unable to handle key: deep") as daemon:
+            session = self.client("phone", user_info={"serviceName": "hidden-service", "number": "hidden-info"})
+            session.message(secret="hidden-text", number="hidden-number", deep={"list": [{"Secret": "hidden-deep"}]}, kept=1)
+            session.ask(UPLOAD_LOG, data=[{"secret": "hidden-log", "kept": 2}])
+            event = self.lab.wait_for_events(1, kept=1)[0]
+            self.lab.received("dashboard", 2)
+            session.ask("flushMessagesWithCompletion:")
+        secret = (self.root.path / "var/lib/veltrad/secret").read_bytes()
+        digest = {text: hmac.new(secret, text.encode(), "sha256").hexdigest() for text in ("hidden-info", "hidden-number")}
+        self.assertEqual(event["number"], digest["hidden-info"])
+        self.assertNotIn("secret", event)
+        seen = json.dumps([self.lab.received(kind) for kind in ("events", "dashboard", "logdata")]) + "\n".join(daemon.text)
+        logs = [path for path in self.root.path.rglob("*") if path.is_file() and "etc" not in path.parts]
+        for text in [seen, *(path.read_bytes().decode("latin-1") for path in logs)]:
+            self.assertNotIn("hidden", text)
+        self.assertIn(digest["hidden-number"], (self.root.path / "var/log/veltrad/energy.jsonl").read_text())
+
+    def test_a_broken_policy_closes_everything_and_says_where(self):
+        with self.serving("Policy could not be read") as daemon:
+            session = self.client()
+            self.root.write(POLICY, b'{"reporting": "on",\n "host": []}')
+            daemon.wait_for_line(f'Policy could not be read, nothing leaves: {self.root.path}/{POLICY}:2:2: unknown key "host"')
+            wait_until(lambda: session.states(**WHO) == [], "no back ends")
+            self.forget()
+            wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends again")
+
+    def test_a_days_limits_hold_over_a_restart_and_for_all_destinations(self):
+        self.say(dailyEvents=6)  # each message: a post and a datagram; the session's own messages too
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            session = self.client()
+            for number in range(4):
+                session.message(number=number)
+            session.close()
+            wait_until(lambda: self.stats().get("event dropped: the owner's limit for the day is used up"), "a drop")
+        counts = self.counts()
+        left = counts["event posted"] + counts["datagram sent"]
+        self.assertEqual(left, 6)
+        self.assertEqual(json.loads((self.root.path / "var/lib/veltrad/daily.json").read_text())["events"], 6)
+        before = self.arrived()
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=5)
+            self.assertEqual(self.arrived(), before)
+            self.say(dailyEvents=6, dailyBytes=10**6)
+        self.say(dailyBytes=1)
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=6)
+        self.assertEqual(self.arrived(), before)
