@@ -4,6 +4,7 @@
 
 #include <sys/random.h>
 #include <sys/socket.h>
+#include <time.h>
 
 #include <cstdint>
 
@@ -17,6 +18,7 @@ namespace key = wire::key;
 namespace {
 
 constexpr const char* kConnectionEnded = "The connection to the daemon ended before the answer came.";
+constexpr unsigned kAddedWithoutTrying = 8;
 constexpr const char* kNoWords = "The daemon has ended the connection.";
 constexpr const char* kStopped = "The daemon has stopped.";
 
@@ -31,6 +33,13 @@ double draw() {
   std::uint32_t bits = 0;
   if (::getrandom(&bits, sizeof bits, GRND_NONBLOCK) != sizeof bits) return 0.5;
   return static_cast<double>(bits) / UINT32_MAX;
+}
+
+// Precise to a few milliseconds, and cheaper than the precise clock.
+WrittenCalls::TimePoint coarseNow() {
+  timespec now{};
+  ::clock_gettime(CLOCK_MONOTONIC_COARSE, &now);
+  return WrittenCalls::TimePoint(std::chrono::seconds(now.tv_sec) + std::chrono::nanoseconds(now.tv_nsec));
 }
 
 Dictionary argumentsOf(const Dictionary& event) {
@@ -148,12 +157,13 @@ void Exchange::tell(veltra_connection_state state, const char* why, ValuePointer
 // ---- Calls ----
 
 veltra_status Exchange::add(CallFrame call, CallTable::Call to) {
-  writeWaiting();  // the connection's thread may be inside a callback
+  // The connection's thread writes what waits, but it may be inside a callback.
+  if (++_added % kAddedWithoutTrying == 0) writeWaiting();
   const bool starts = call.change && call.change->starts;
   const bool awaited = to.awaitsAnswer();
   const std::uint32_t callID =
-      awaited || starts || _record.calls().shouldAsk(Reconnection::Clock::now()) ? _calls.takeID() : 0;
-  setCallID(call.frame, callID);
+      awaited || starts || _record.calls().shouldAsk(coarseNow()) ? _calls.takeID() : 0;
+  if (callID != 0) setCallID(call.frame, callID);
   const veltra_status status =
       _out.write({std::move(call.frame), std::move(call.file), std::move(call.change), call.counted});
   if (status != VELTRA_OK) return status;

@@ -98,6 +98,7 @@ class Exchange {
   OutFrames _out;
   CallTable _calls;
   Reconnection _wish;
+  unsigned _added = 0;
   // The last call that starts the session; 0 if there is none.
   std::uint32_t _startID = 0;
   std::uint64_t _connections = 0;

@@ -7,9 +7,13 @@
 namespace veltrad::client {
 
 bool WrittenCalls::shouldAsk(TimePoint now) {
-  if (++_unasked < kMostUnasked && now - _lastAsked < kLongestUnasked) return false;
+  if (now - _periodBegan >= kPeriod) {
+    _periodBegan = now;
+    _askedInPeriod = 0;
+  }
+  if (_askedInPeriod >= kAskedInPeriod && ++_unasked < kMostUnasked) return false;
+  ++_askedInPeriod;
   _unasked = 0;
-  _lastAsked = now;
   return true;
 }
 

@@ -14,10 +14,11 @@ class WrittenCalls {
  public:
   using TimePoint = std::chrono::steady_clock::time_point;
 
-  // Of calls without an answer, every 64th asks for one all the same, and so does one after a pause, so that
-  // few are uncertain when the daemon is killed.
+  // Of calls that want no answer, the first 16 in each 10 ms ask for one all the same, and then every 64th,
+  // so that few are uncertain when the daemon is killed and a flood costs hardly more.
+  static constexpr unsigned kAskedInPeriod = 16;
+  static constexpr std::chrono::milliseconds kPeriod{10};
   static constexpr unsigned kMostUnasked = 64;
-  static constexpr std::chrono::milliseconds kLongestUnasked{10};
   // Whether the next call, which wants no answer, should ask for one.
   bool shouldAsk(TimePoint now);
 
@@ -49,8 +50,9 @@ class WrittenCalls {
   std::deque<std::uint64_t> _uncounted;
   // Calls after `_ran` that ask for an answer, in the order of writing.
   std::deque<Asked> _asked;
+  TimePoint _periodBegan{};
+  unsigned _askedInPeriod = 0;
   unsigned _unasked = 0;
-  TimePoint _lastAsked{};
 };
 
 }  // namespace veltrad::client

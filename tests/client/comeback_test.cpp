@@ -2,7 +2,8 @@
 // A session whose daemon goes away and comes back, and one in a forked child.
 #include <sys/wait.h>
 
-#include <csignal>
+#include <filesystem>
+#include <fstream>
 
 #include "harness.h"
 
@@ -161,6 +162,28 @@ TEST(Comeback, AnAggregatingClientGetsOneEndMark) {
   ASSERT_TRUE(described.waitForLines(4));
   EXPECT_THAT(copies.lines(), ElementsAre("1", "2", "3", "end"));
   EXPECT_THAT(described.lines(), ElementsAre("true", "true", "true", "false"));
+}
+
+// Threads of this process that belong to sessions.
+int sessionThreads() {
+  int found = 0;
+  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+    std::string name;
+    std::getline(std::ifstream(task.path() / "comm") >> std::ws, name);
+    found += name == "veltra";
+  }
+  return found;
+}
+
+TEST(Comeback, AThreadComesWithTheFirstCallThatNeedsIt) {
+  FakeDaemon daemon(answerPlainly);
+  veltra::Session session = open(daemon);
+  EXPECT_EQ(textOf(session.sendAndWait(2, 3, {})), "2/3");
+  EXPECT_EQ(sessionThreads(), 0);
+  ASSERT_TRUE(session.start());  // a session that was started comes back by itself
+  EXPECT_EQ(sessionThreads(), 1);
+  session.close();
+  EXPECT_EQ(sessionThreads(), 0);
 }
 
 // Runs `child` in a forked process; true if it returned true there.

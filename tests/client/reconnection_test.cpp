@@ -80,10 +80,11 @@ TEST(Reconnection, WhatAConnectionHasRunIsKnownFromAnswersAndAGoodbye) {
     calls.clear();
   }
   const WrittenCalls::TimePoint now{std::chrono::hours(1)};
-  EXPECT_TRUE(calls.shouldAsk(now));
+  for (unsigned i = 0; i < WrittenCalls::kAskedInPeriod; ++i) EXPECT_TRUE(calls.shouldAsk(now));
   for (unsigned i = 1; i < WrittenCalls::kMostUnasked; ++i) EXPECT_FALSE(calls.shouldAsk(now));
   EXPECT_TRUE(calls.shouldAsk(now));
-  EXPECT_TRUE(calls.shouldAsk(now + WrittenCalls::kLongestUnasked));
+  EXPECT_FALSE(calls.shouldAsk(now));
+  EXPECT_TRUE(calls.shouldAsk(now + WrittenCalls::kPeriod));
 }
 
 }  // namespace

@@ -14,6 +14,7 @@ import socket
 import ssl
 import struct
 import subprocess
+import sys
 import tempfile
 import threading
 import time
@@ -261,6 +262,18 @@ class Daemon(Process):
         return took
 
 
+# Hands the two descriptors in its arguments over like a service manager and becomes the program that follows.
+HAND_OVER = ("import os, sys; [os.dup2(int(n), 20 + i) for i, n in enumerate(sys.argv[1:3])]; "
+             "os.dup2(20, 3); os.dup2(21, 4); os.environ.update(LISTEN_FDS='2', LISTEN_PID=str(os.getpid())); "
+             "os.execv(sys.argv[3], sys.argv[3:])")
+
+
+def activated(*listeners):
+    """Options of a Daemon that gets these two listening sockets."""
+    handed = [listener.fileno() for listener in listeners]
+    return {"wrapper": (sys.executable, "-c", HAND_OVER, *map(str, handed)), "pass_fds": handed}
+
+
 START = "startConfigWithCompletionHandler:"
 IDENTITY = ("--client", "phone", "--service", "ringer", "--require-user-info")
 
@@ -364,8 +377,9 @@ def storebag(version="v1", backends=None, **more):
 class SystemTest(unittest.TestCase):
     """A root directory, a lab that serves "quindle" and "ostvane", and daemons, which are stopped and checked at the end."""
     lab_arguments = ()
+    opened = ()  # the clients of the daemon that serves
+
     def setUp(self):
-        self.opened = []
         self.root = Root()
         self.addCleanup(self.root.remove)
         self.lab = Lab(*self.lab_arguments)
@@ -397,7 +411,7 @@ class SystemTest(unittest.TestCase):
             daemon.kill()  # so that the next row of a table can start its own
             raise
         finally:
-            opened, self.opened = self.opened, []
+            opened, self.opened = self.opened, ()
         daemon.stop()
         for ctl in opened:  # else it would come back to the next daemon
             ctl.kill()
@@ -406,7 +420,7 @@ class SystemTest(unittest.TestCase):
         """Starts a session with veltractl; returns it and the answer to its start."""
         ctl = Ctl(self.root, *arguments, **options)
         self.addCleanup(ctl.kill)
-        self.opened.append(ctl)
+        self.opened = (*self.opened, ctl)
         answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]

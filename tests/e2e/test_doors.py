@@ -6,10 +6,9 @@ import os
 import re
 import signal
 import socket
-import sys
 import time
 
-from harness import BUILD, DEADLINE, ENTITLEMENT, Ctl, Daemon, SystemTest, Wire, wait_until
+from harness import BUILD, Ctl, DEADLINE, Daemon, ENTITLEMENT, SystemTest, Wire, activated, wait_until
 
 
 class Doors(SystemTest):
@@ -81,8 +80,6 @@ class Doors(SystemTest):
         the transaction and of the end."""
         os.makedirs(os.path.dirname(self.root.socket))
         notify = str(self.root.path / "notify")
-        wrapper = ("import os, sys; [os.dup2(int(n), 20 + i) for i, n in enumerate(sys.argv[1:3])]; "
-                   "os.dup2(20, 3); os.dup2(21, 4); os.environ.update(LISTEN_FDS='2', LISTEN_PID=str(os.getpid())); os.execv(sys.argv[3], sys.argv[3:])")
         with (socket.socket(socket.AF_UNIX) as listener, socket.socket(socket.AF_UNIX) as control,
               socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM) as manager):
             manager.bind(notify)
@@ -97,9 +94,7 @@ class Doors(SystemTest):
             control.bind(os.path.dirname(self.root.socket) + "/control.sock")
             listener.listen(5)
             control.listen(5)
-            handed = (control.fileno(), listener.fileno())
-            with self.serving(wrapper=(sys.executable, "-c", wrapper, *map(str, handed)), pass_fds=handed,
-                              env={"NOTIFY_SOCKET": notify, "WATCHDOG_USEC": "1000000"}):
+            with self.serving(**activated(control, listener), env={"NOTIFY_SOCKET": notify, "WATCHDOG_USEC": "1000000"}):
                 for word in ("READY=1", "WATCHDOG=1"):
                     hears(word)
                 waiting = Wire(self.root)
