@@ -17,14 +17,15 @@ KINDS = {"message in state 1": ("waits", REFUSED), "event in a post of 50": ("wa
 MESSAGES = 1000
 PATIENCE = 300  # seconds
 GROWTH = 1.05
-# What may come and go without a change of the code: on a busy machine a thread finds the next message before it waits, and the
-# message log, in which the text of a datagram is kept, is written several lines at a time.
+# What may come and go without a change of the code. Where threads pass work on, a busy machine decides who finds it before it
+# waits, and how many lines the message log takes at a time.
 NOISE = {"instructions": 0, "page faults": 0.02, "waits": 0.5, "system calls": 0.1}
-NOISE_OF_THE_LOG = {"waits": 2, "system calls": 3}
+NOISE_OF_THREADS = {"waits": 2, "system calls": 3}
+MANY_THREADS = ("event that is flushed", "datagram")
 
 
 def noise(kind, name):
-    return NOISE_OF_THE_LOG.get(kind, NOISE[kind]) if name == "datagram" else NOISE[kind]
+    return NOISE_OF_THREADS.get(kind, NOISE[kind]) if name in MANY_THREADS else NOISE[kind]
 
 
 class NothingPosted(Exception):
@@ -133,8 +134,8 @@ def compare(before, now):
         for name, count in counts.items():
             was = before.get(kind, {}).get(name)
             if was is not None and count > was * GROWTH + noise(kind, name):
-                grown.append(f"{kind} of a {name}: {number(was)} before, {number(count)} now"
-                             f" ({(count / was - 1) * 100:+.1f} %)" if was else f"{kind} of a {name}: none before, {number(count)} now")
+                change = f"{(count / was - 1) * 100:+.1f} %" if was else "none before"
+                grown.append(f"{kind}, {name}: {number(was)} before, {number(count)} now ({change})")
     return grown
 
 

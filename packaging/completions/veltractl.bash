@@ -40,9 +40,9 @@ _veltractl() {
   [[ $path == "" ]] || words+=" --root --json --version -h --help"
   if [[ $current != -* ]]; then
     case $path+$given in
-    /config/get+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
-    /config/set+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
-    /config/unset+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
+    /config/get+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU ReportingOff veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
+    /config/set+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU ReportingOff veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
+    /config/unset+0) words="DiagnosticLogSubmissionEnabled environmentType forceEventLogging httpsPostURL httpsRealtimePostURL uuidOverrideDNU uuidRespectDNU ReportingOff veltra_storebag_url com.florn.timed/TMAutomaticTimeZoneEnabled" ;;
     esac
     case $path in
       /upload | /upload-log-data) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;

@@ -25,13 +25,13 @@ void VeltraBackend::updateState() {
   setState({kBackendReporting, wire::Reason::always});
 }
 
-Sent VeltraBackend::sendMessage(const Dictionary* payload, platform::TimeValue timestamp,
+Sent VeltraBackend::sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp,
                                 std::uint16_t method, std::uint16_t respCode, std::int32_t flag) {
   ++_eventID;
-  return sendNumberedMessage({payload, timestamp, method, respCode, _eventID, flag});
+  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag});
 }
 
-Sent VeltraBackend::sendNumberedMessage(const NumberedMessage&) {
+Sent VeltraBackend::sendNumberedMessage(NumberedMessage&&) {
   return {};
 }
 

@@ -54,9 +54,8 @@ struct Sent {
   std::optional<std::string> text;
 };
 
-// The payload may be null.
 struct NumberedMessage {
-  const Dictionary* payload = nullptr;
+  std::optional<Dictionary> payload;
   platform::TimeValue timestamp;
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
@@ -81,10 +80,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual void updateState();
 
   // Numbers the message (1, 2, … 65535, 0, …) and passes it on.
-  Sent sendMessage(const Dictionary* payload, platform::TimeValue timestamp, std::uint16_t method,
+  Sent sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp, std::uint16_t method,
                    std::uint16_t respCode, std::int32_t flag);
-  // By default the back end takes no messages.
-  virtual Sent sendNumberedMessage(const NumberedMessage& message);
+  // May take the payload out of the message, so that nothing in it needs to be copied. By default the back
+  // end takes no messages.
+  virtual Sent sendNumberedMessage(NumberedMessage&& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);

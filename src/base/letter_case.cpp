@@ -2,6 +2,8 @@
 // The functions of text.h that need Unicode's tables. A file of their own, since libveltra needs neither.
 #include <utf8proc.h>
 
+#include <algorithm>
+
 #include "base/text.h"
 
 namespace veltrad {
@@ -23,7 +25,11 @@ std::string lowerCase(std::string_view text) {
 }
 
 bool equalIgnoringCase(std::string_view a, std::string_view b) {
-  return a == b || lowerCase(a) == lowerCase(b);
+  if (!isASCII(a) || !isASCII(b)) return lowerCase(a) == lowerCase(b);
+  // Most texts are ASCII, for which no copies are needed.
+  const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; };
+  return std::equal(a.begin(), a.end(), b.begin(), b.end(),
+                    [lower](char x, char y) { return lower(x) == lower(y); });
 }
 
 bool containsIgnoringCase(std::string_view text, std::string_view part) {

@@ -2,8 +2,11 @@
 // The binary property list format: its constants, and its trailer.
 #pragma once
 
+#include <endian.h>
+
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <string_view>
 
 #include "base/property_list.h"
@@ -36,6 +39,11 @@ inline constexpr double kSecondsFrom1970To2001 = 978'307'200;
 // `size` is 1 to 8.
 inline std::uint64_t bigEndian(const char* at, std::size_t size) {
   std::uint64_t number = static_cast<std::uint8_t>(at[0]);
+  if (size == 1) return number;  // the most frequent case
+  if (size == 8) {
+    std::memcpy(&number, at, 8);
+    return be64toh(number);
+  }
   for (std::size_t i = 1; i < size; ++i) number = number << 8 | static_cast<std::uint8_t>(at[i]);
   return number;
 }

@@ -23,7 +23,7 @@ using Kind = PropertyListError::Kind;
 
 // The memory of a string that was allocated with this length; a short one is stored in the object itself.
 std::size_t textBlock(std::size_t length) {
-  static const std::size_t kInPlace = std::string().capacity();
+  const std::size_t kInPlace = std::string().capacity();  // known to the compiler
   return length > kInPlace ? blockBytes(length + 1) : 0;
 }
 
@@ -178,7 +178,7 @@ bool Reader::readObject(Object& object, const Path* path, int depth, Value& valu
     case kUTF16: {
       std::string text;
       if (!readText(object, text)) return false;
-      value = Value(std::move(text));
+      value.hold(std::move(text));
       return true;
     }
     case kUID:
@@ -197,7 +197,7 @@ bool Reader::readSimple(const Object& object, Value& value) {
   if (object.marker != kFalse && object.marker != kTrue) {
     return malformed(object, object.marker == kNull ? "a null outside a dictionary" : "unknown type");
   }
-  value = Value(object.marker == kTrue);
+  value.hold(object.marker == kTrue);
   return true;
 }
 
@@ -208,16 +208,16 @@ bool Reader::readInteger(Object& object, Value& value) {
   if (!take(object, 1, std::size_t{1} << exponent, bytes)) return false;
   if (exponent < 4) {
     // 1, 2 and 4 bytes are unsigned, 8 signed.
-    value = Value(static_cast<std::int64_t>(bigEndian(bytes.data(), bytes.size())));
+    value.hold(static_cast<std::int64_t>(bigEndian(bytes.data(), bytes.size())));
     return true;
   }
   const std::uint64_t high = bigEndian(bytes.data(), 8);
   const std::uint64_t low = bigEndian(bytes.data() + 8, 8);
   const auto asSigned = static_cast<std::int64_t>(low);
   if (high == (asSigned < 0 ? ~std::uint64_t{0} : 0)) {
-    value = Value(asSigned);
+    value.hold(asSigned);
   } else if (high == 0) {
-    value = Value(low);
+    value.hold(low);
   } else {
     return malformed(object, "an integer beyond 64 bits");
   }
@@ -231,8 +231,8 @@ bool Reader::readReal(Object& object, Value& value) {
   std::string_view bytes;
   if (!take(object, 1, size, bytes)) return false;
   const std::uint64_t bits = bigEndian(bytes.data(), size);
-  value = size == 8 ? Value(std::bit_cast<double>(bits))
-                    : Value(static_cast<double>(std::bit_cast<float>(static_cast<std::uint32_t>(bits))));
+  value.hold(size == 8 ? std::bit_cast<double>(bits)
+                       : static_cast<double>(std::bit_cast<float>(static_cast<std::uint32_t>(bits))));
   return true;
 }
 
@@ -240,7 +240,7 @@ bool Reader::readDate(Object& object, Value& value) {
   if (object.marker != kDate) return malformed(object, "unknown type");
   std::string_view bytes;
   if (!take(object, 1, 8, bytes)) return false;
-  value = Value(Date{std::bit_cast<double>(bigEndian(bytes.data(), 8)) + kSecondsFrom1970To2001});
+  value.hold(Date{std::bit_cast<double>(bigEndian(bytes.data(), 8)) + kSecondsFrom1970To2001});
   return true;
 }
 
@@ -249,7 +249,7 @@ bool Reader::readUID(Object& object, Value& value) {
   if (size > 8) return malformed(object, "an identifier beyond 64 bits");
   std::string_view bytes;
   if (!take(object, 1, size, bytes)) return false;
-  value = Value(bigEndian(bytes.data(), size));
+  value.hold(bigEndian(bytes.data(), size));
   return true;
 }
 
@@ -321,7 +321,7 @@ bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& 
   std::string_view references;
   if (!enter(object, path, depth) || !takeCount(object, count) ||
       !take(object, count, 2 * _trailer.referenceSize, references) || !charge(2 * count) ||
-      !chargeMemory(sharedBytes<Dictionary>() + blockBytes(count * sizeof(Dictionary::Entry)))) {
+      !chargeMemory(dictionaryBytes(count))) {
     return false;
   }
   const Path here{object.number, path};
@@ -341,7 +341,7 @@ bool Reader::readDictionary(Object& object, const Path* path, int depth, Value& 
       return false;
     }
   }
-  value = Value(Dictionary::fromEntries(std::move(entries)));
+  value.hold(Dictionary::fromEntries(std::move(entries)));
   return true;
 }
 

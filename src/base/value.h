@@ -2,6 +2,8 @@
 // Value: the content of a property list. Immutable and shared: copies are cheap, a change makes a new value.
 #pragma once
 
+#include <atomic>
+#include <cstddef>
 #include <cstdint>
 #include <initializer_list>
 #include <memory>
@@ -14,7 +16,6 @@
 
 namespace veltrad {
 
-class Dictionary;
 class Value;
 
 using Array = std::vector<Value>;
@@ -29,6 +30,78 @@ struct Date {
 struct Data {
   std::string bytes;
   bool operator==(const Data&) const = default;
+};
+
+// Keys are unique and are enumerated in ascending order of their bytes. Copies share their entries until one
+// of them is changed, so copying costs an add.
+class Dictionary {
+ public:
+  using Entry = std::pair<std::string, Value>;
+  using const_iterator = const Entry*;
+
+  Dictionary() = default;
+  Dictionary(std::initializer_list<Entry> entries);
+  Dictionary(const Dictionary& other) noexcept;
+  Dictionary(Dictionary&& other) noexcept : _shared(std::exchange(other._shared, nullptr)) {}
+  Dictionary& operator=(Dictionary other) noexcept {
+    std::swap(_shared, other._shared);
+    return *this;
+  }
+  ~Dictionary() {
+    if (_shared) release();
+  }
+  // Entries in any order; of equal keys the last one counts.
+  static Dictionary fromEntries(std::vector<Entry> entries);
+
+  const Value* find(std::string_view key) const;
+  bool contains(std::string_view key) const { return find(key) != nullptr; }
+  // Adds or replaces. Linear in the number of entries after the key; use fromEntries for many entries.
+  void set(std::string key, Value value);
+  template <typename T>
+  void setIfPresent(std::string key, const std::optional<T>& value) {
+    if (value) set(std::move(key), *value);
+  }
+  // True if the key was present.
+  bool erase(std::string_view key);
+  // Removes the key and returns its value.
+  std::optional<Value> take(std::string_view key);
+  // Moves the dictionary or array under the key out and leaves an empty one; absent without such an entry.
+  std::optional<Dictionary> takeDictionary(std::string_view key);
+  std::optional<Array> takeArray(std::string_view key);
+  // Adds or replaces every entry of `other`, in linear time.
+  void merge(const Dictionary& other);
+  // All entries, in order; they are copied only if they are shared.
+  std::vector<Entry> takeEntries() &&;
+
+  std::size_t size() const;
+  std::size_t capacity() const;
+  bool empty() const { return size() == 0; }
+  const_iterator begin() const;
+  const_iterator end() const;
+
+  // The key's value as this type, by the rules of Value; else absent or null.
+  const std::string* string(std::string_view key) const;
+  const Dictionary* dictionary(std::string_view key) const;
+  const Array* array(std::string_view key) const;
+  std::optional<bool> boolean(std::string_view key) const;
+  std::optional<std::int32_t> int32(std::string_view key) const;
+  std::optional<std::uint32_t> uint32(std::string_view key) const;
+  std::optional<std::uint16_t> uint16(std::string_view key) const;
+  std::optional<double> real(std::string_view key) const;
+
+  bool operator==(const Dictionary& other) const;
+
+ private:
+  friend std::size_t keptBytes(const Dictionary& dictionary);
+  friend std::size_t dictionaryBytes(std::size_t entries);
+  struct Shared;
+
+  void release() noexcept;
+  // The entries, which are copied first if they are shared.
+  std::vector<Entry>& own();
+
+  // Null if there are no entries.
+  Shared* _shared = nullptr;
 };
 
 class Value {
@@ -61,11 +134,17 @@ class Value {
   const Date* asDate() const { return std::get_if<Date>(&_held); }
   const Data* asData() const { return shared<Data>(); }
   const Array* asArray() const { return shared<Array>(); }
-  const Dictionary* asDictionary() const { return shared<Dictionary>(); }
+  const Dictionary* asDictionary() const { return std::get_if<Dictionary>(&_held); }
 
-  // The content, moved out if nobody shares it, else copied; absent for any other type.
+  // The content, moved out unless others share it; absent for any other type.
   std::optional<Dictionary> takeDictionary() &&;
   std::optional<Array> takeArray() &&;
+
+  // Replaces the content by one of the types that are held as they are, without a value in between.
+  template <typename Content>
+  void hold(Content content) {
+    _held.emplace<Content>(std::move(content));
+  }
 
   bool isBoolean() const { return type() == Type::boolean; }
   // An integer or a real, not a boolean.
@@ -99,66 +178,33 @@ class Value {
     return wide ? std::optional(static_cast<Integer>(*wide)) : std::nullopt;
   }
 
-  friend class Dictionary;
   // In the order of Type.
   std::variant<bool, std::int64_t, std::uint64_t, double, std::string, Date, std::shared_ptr<const Data>,
-               std::shared_ptr<const Array>, std::shared_ptr<const Dictionary>>
+               std::shared_ptr<const Array>, Dictionary>
       _held;
 };
 
-// Keys are unique and are enumerated in ascending order of their bytes.
-class Dictionary {
- public:
-  using Entry = std::pair<std::string, Value>;
-  using const_iterator = std::vector<Entry>::const_iterator;
-
-  Dictionary() = default;
-  Dictionary(std::initializer_list<Entry> entries);
-  // Entries in any order; of equal keys the last one counts.
-  static Dictionary fromEntries(std::vector<Entry> entries);
-
-  const Value* find(std::string_view key) const;
-  bool contains(std::string_view key) const { return find(key) != nullptr; }
-  // Adds or replaces. Linear in the number of entries after the key; use fromEntries for many entries.
-  void set(std::string key, Value value);
-  template <typename T>
-  void setIfPresent(std::string key, const std::optional<T>& value) {
-    if (value) set(std::move(key), Value(*value));
-  }
-  // True if the key was present.
-  bool erase(std::string_view key) { return take(key).has_value(); }
-  // Removes the key and returns its value.
-  std::optional<Value> take(std::string_view key);
-  // Adds or replaces every entry of `other`, in linear time.
-  void merge(const Dictionary& other);
-
-  std::size_t size() const { return _entries.size(); }
-  std::size_t capacity() const { return _entries.capacity(); }
-  bool empty() const { return _entries.empty(); }
-  const_iterator begin() const { return _entries.begin(); }
-  const_iterator end() const { return _entries.end(); }
-
-  // The key's value as this type, by the rules of Value; else absent or null.
-  const std::string* string(std::string_view key) const { return read(key, &Value::asString); }
-  const Dictionary* dictionary(std::string_view key) const { return read(key, &Value::asDictionary); }
-  const Array* array(std::string_view key) const { return read(key, &Value::asArray); }
-  std::optional<bool> boolean(std::string_view key) const { return read(key, &Value::toBoolean); }
-  std::optional<std::int32_t> int32(std::string_view key) const { return read(key, &Value::toInt32); }
-  std::optional<std::uint32_t> uint32(std::string_view key) const { return read(key, &Value::toUInt32); }
-  std::optional<std::uint16_t> uint16(std::string_view key) const { return read(key, &Value::toUInt16); }
-  std::optional<double> real(std::string_view key) const { return read(key, &Value::toDouble); }
-
-  bool operator==(const Dictionary& other) const { return _entries == other._entries; }
-
- private:
-  template <typename Result>
-  Result read(std::string_view key, Result (Value::*as)() const) const {
-    const Value* value = find(key);
-    return value ? (value->*as)() : Result();
-  }
-  std::vector<Entry>::iterator place(std::string_view key);
-  std::vector<Entry> _entries;
+// Entries, and the number of dictionaries that share them.
+struct Dictionary::Shared {
+  std::atomic<std::size_t> owners{1};
+  std::vector<Entry> entries;
 };
+
+inline Dictionary::Dictionary(const Dictionary& other) noexcept : _shared(other._shared) {
+  if (_shared) _shared->owners.fetch_add(1, std::memory_order_relaxed);
+}
+inline std::size_t Dictionary::size() const {
+  return _shared ? _shared->entries.size() : 0;
+}
+inline std::size_t Dictionary::capacity() const {
+  return _shared ? _shared->entries.capacity() : 0;
+}
+inline Dictionary::const_iterator Dictionary::begin() const {
+  return _shared ? _shared->entries.data() : nullptr;
+}
+inline Dictionary::const_iterator Dictionary::end() const {
+  return begin() + size();
+}
 
 // What malloc uses for a block of this many bytes; 0 for none.
 constexpr std::size_t blockBytes(std::size_t bytes) {
@@ -169,6 +215,8 @@ template <typename T>
 constexpr std::size_t sharedBytes() {
   return blockBytes(sizeof(T) + 2 * sizeof(void*));
 }
+// The memory that a dictionary with room for so many entries takes, without what the entries keep.
+std::size_t dictionaryBytes(std::size_t entries);
 // The memory that a text, value or container keeps besides its own object. What it shares with others counts
 // in full.
 std::size_t keptBytes(const std::string& text);

@@ -34,6 +34,8 @@ enum class JSONStyle { compact, pretty };
 // `expectedBytes` is at least the length of the result, the buffer is allocated only once.
 std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact,
                       std::size_t expectedBytes = 0);
+// The same into a string, which is overwritten and keeps its capacity.
+void writeJSON(const Value& value, JSONStyle style, std::string& out);
 // The first bytes of the compact text, at most `most` of them and whole characters, and the number of bytes
 // left out. The rest of the text is never in memory.
 struct JSONExcerpt {

@@ -33,22 +33,13 @@ Refusal mustBe(const char* argument, const char* type) {
   return fmt::format("argument \"{}\" must be {}", argument, type);
 }
 
-wire::OptionalDictionary takenDictionary(Call& call, std::string_view name) {
-  auto value = call.arguments.take(name);
-  return value ? std::move(*value).takeDictionary() : std::nullopt;
-}
-
-std::optional<Array> takenArray(Call& call, std::string_view name) {
-  auto value = call.arguments.take(name);
-  return value ? std::move(*value).takeArray() : std::nullopt;
-}
-
 Refusal setSessionInfo(Call& call) {
   const bool aggregates = call.arguments.boolean(key::kHasAggregationBlock).value_or(false);
-  auto sessionInfo = takenDictionary(call, key::kSessionInfo);
-  auto userInfo = takenDictionary(call, key::kUserInfo);
-  const bool described = call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
-                                                     takenArray(call, key::kFrameworksToCheck), aggregates);
+  auto sessionInfo = call.arguments.takeDictionary(key::kSessionInfo);
+  auto userInfo = call.arguments.takeDictionary(key::kUserInfo);
+  const bool described =
+      call.session.setSessionInfo(std::move(sessionInfo), std::move(userInfo),
+                                  call.arguments.takeArray(key::kFrameworksToCheck), aggregates);
   if (!described && call.pending) {
     call.pending->fail(wire::makeReportingError(
         "The session's description is more than the daemon may keep for its user; try again later.", -1));
@@ -64,7 +55,7 @@ Refusal startConfig(Call& call) {
 }
 
 Refusal fetchStates(Call& call) {
-  call.session.fetchStatesWithUserInfo(takenDictionary(call, key::kUserInfo),
+  call.session.fetchStatesWithUserInfo(call.arguments.takeDictionary(key::kUserInfo),
                                        namesReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -78,13 +69,13 @@ Refusal sendMessageWithCategory(Call& call) {
   const auto category = call.arguments.uint16(key::kCategory);
   const auto type = call.arguments.uint16(key::kType);
   if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
-  call.session.sendMessageWithCategory(*category, *type, takenDictionary(call, key::kPayload),
+  call.session.sendMessageWithCategory(*category, *type, call.arguments.takeDictionary(key::kPayload),
                                        sentReply(std::move(call.pending)));
   return std::nullopt;
 }
 
 Refusal sendMessageWithDictionary(Call& call) {
-  auto message = takenDictionary(call, key::kMessage);
+  auto message = call.arguments.takeDictionary(key::kMessage);
   if (!message) return mustBe(key::kMessage, "a dictionary");
   call.session.sendMessageWithDictionary(std::move(*message), sentReply(std::move(call.pending)));
   return std::nullopt;
@@ -108,7 +99,7 @@ Refusal uploadFile(Call& call) {
 }
 
 Refusal uploadLogData(Call& call) {
-  auto data = takenArray(call, key::kData);
+  auto data = call.arguments.takeArray(key::kData);
   if (!data) return mustBe(key::kData, "an array");
   call.session.uploadLogData(std::move(*data), uploadLogDataReply(std::move(call.pending)));
   return std::nullopt;
@@ -118,10 +109,10 @@ Refusal sendMessageWithSessionInfo(Call& call) {
   const auto category = call.arguments.uint16(key::kCategory);
   const auto type = call.arguments.uint16(key::kType);
   if (!category || !type) return mustBe(category ? key::kType : key::kCategory, "a number");
-  auto sessionInfo = takenDictionary(call, key::kSessionInfo);
-  auto userInfo = takenDictionary(call, key::kUserInfo);
+  auto sessionInfo = call.arguments.takeDictionary(key::kSessionInfo);
+  auto userInfo = call.arguments.takeDictionary(key::kUserInfo);
   call.session.sendMessageWithSessionInfo(std::move(sessionInfo), std::move(userInfo), *category, *type,
-                                          takenDictionary(call, key::kPayload),
+                                          call.arguments.takeDictionary(key::kPayload),
                                           sentReply(std::move(call.pending)));
   return std::nullopt;
 }
@@ -129,6 +120,8 @@ Refusal sendMessageWithSessionInfo(Call& call) {
 struct Operation {
   std::string_view name;
   Refusal (*run)(Call&);
+  // Answers of earlier calls must not wait until it has been run.
+  bool mayBlock = false;
 };
 
 // The most frequent first.
@@ -138,12 +131,12 @@ constexpr Operation kOperations[] = {
     {operation::kFlushMessages, flushMessages},
     {operation::kFetchStates, fetchStates},
     {operation::kSetSessionInfo, setSessionInfo},
-    {operation::kStartConfig, startConfig},
+    {operation::kStartConfig, startConfig, true},
     {operation::kFinishSession, finishSession},
-    {operation::kSendOneShot, sendMessageWithSessionInfo},
+    {operation::kSendOneShot, sendMessageWithSessionInfo, true},
     {operation::kFetchDisplayURL, fetchDisplayURL},
-    {operation::kUploadFile, uploadFile},
-    {operation::kUploadLogData, uploadLogData},
+    {operation::kUploadFile, uploadFile, true},
+    {operation::kUploadLogData, uploadLogData, true},
 };
 
 const Operation* operationNamed(std::string_view name) {
@@ -262,16 +255,14 @@ Result<Decoded, std::string> decode(const wire::Frame& frame, CallMemory& memory
   auto decoded = large ? decodeLargeCall(frame, memory) : decodeCall(frame, memory);
   if (!decoded) return Failure{decoded.error()};
   Dictionary& body = decoded.value();
-  auto given = body.take(key::kArguments);
+  auto arguments = body.takeDictionary(key::kArguments);
   const std::string* name = body.string(key::kOperation);
   if (!name) return Failure{std::string("\"op\" must be a text")};
   if (large && *name != operation::kUploadLogData) {
     return Failure{fmt::format("a large call is for \"{}\" alone, not for \"{}\"", operation::kUploadLogData,
                                shortened(*name))};
   }
-  auto arguments = given ? std::move(*given).takeDictionary() : std::nullopt;
-  if (!arguments) arguments.emplace();
-  return Decoded{std::move(body), name, std::move(*arguments)};
+  return Decoded{std::move(body), name, arguments ? std::move(*arguments) : Dictionary()};
 }
 
 // Runs `run` on the call that the frame holds; a call that cannot be read gets an error.
@@ -304,6 +295,7 @@ std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSe
                   [&](Decoded& call, const std::shared_ptr<PendingReply>& pending) -> Refusal {
                     const Operation* operation = operationNamed(*call.name);
                     if (!operation) return unknownOperation(*call.name);
+                    if (operation->mayBlock) out->flush();
                     Call running{session, call.arguments, extensionToken, pending};
                     return operation->run(running);
                   });

@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
+#include <utility>
 
 #include "wire/frame.h"
 
@@ -65,6 +66,12 @@ OutQueue::Sent OutQueue::put(std::string_view frame, Kind kind) {
   const std::size_t whole = frame.size();
   Lock lock(_mutex);
   if (_gone) return Sent::gone;
+  if (_waiting.empty() && _held && charge(frame.size(), kind)) {
+    // The connection's thread writes it soon.
+    _waiting.assign(frame);
+    _waitingBytes.store(_waiting.size(), std::memory_order_relaxed);
+    return Sent::done;
+  }
   if (_waiting.empty()) {
     if (!writeSome(frame)) return Sent::gone;
     if (frame.empty()) return Sent::done;
@@ -153,9 +160,18 @@ void OutQueue::giveUp() {
   _waitingBytes.store(0, std::memory_order_relaxed);
 }
 
-std::size_t OutQueue::flush() {
-  if (waitingBytes() == 0) return 0;
+void OutQueue::hold() {
+  if (std::exchange(_holds, true)) return;
   Lock lock(_mutex);
+  _held = true;
+}
+
+std::size_t OutQueue::flush() {
+  if (!_holds && waitingBytes() == 0) return 0;
+  _holds = false;
+  Lock lock(_mutex);
+  _held = false;
+  if (_waiting.empty()) return 0;
   std::string_view rest = std::string_view(_waiting).substr(_written);
   if (!writeSome(rest)) return 0;
   _written = _waiting.size() - rest.size();

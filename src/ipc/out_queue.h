@@ -24,7 +24,7 @@ inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
 
 // Takes frames from any thread, writes them in order without blocking, and limits the memory for a client
 // that does not read. Owns the socket and the wake-up descriptor. Shared by the connection and by everything
-// that may still answer, so it may outlive the connection; the counters must outlive it. Its 14 fields hold
+// that may still answer, so it may outlive the connection; the counters must outlive it. Its 16 fields hold
 // the descriptors twice: as owners under the lock, and as numbers for the connection's thread, which polls
 // without it.
 class OutQueue {
@@ -57,6 +57,9 @@ class OutQueue {
   int wakeUp() const { return _readWakeUp; }
   void drainWakeUp();
   std::size_t waitingBytes() const { return _waitingBytes.load(std::memory_order_relaxed); }
+  // Until flush(), frames wait so that several are written in one call. To be used only while the thread does
+  // not block.
+  void hold();
   // Writes as much as possible, and returns the number of bytes that still wait.
   std::size_t flush();
   // Closes the socket so that the client can still read what was written to it.
@@ -79,6 +82,9 @@ class OutQueue {
   const int _readSocket;
   const int _readWakeUp;
 
+  // Used only by the connection's own thread: whether it has called hold().
+  bool _holds = false;
+
   std::atomic<bool> _endRequested{false};
   // Written under the lock; read by the connection's thread, which is woken when it rises from zero.
   std::atomic<std::size_t> _waitingBytes{0};
@@ -87,6 +93,7 @@ class OutQueue {
   FileDescriptor _socket GUARDED_BY(_mutex);
   FileDescriptor _wakeUp GUARDED_BY(_mutex);
   bool _gone GUARDED_BY(_mutex) = false;
+  bool _held GUARDED_BY(_mutex) = false;
   std::string _waiting GUARDED_BY(_mutex);
   // Events are charged as kept, replies as working memory.
   platform::Charge _events GUARDED_BY(_mutex);

@@ -28,6 +28,8 @@ constexpr std::chrono::seconds kLastWrites{1};
 // The wait while unfinished frames take all memory that the user may use for them: most of them end soon,
 // some never.
 constexpr std::chrono::seconds kLongestWaitForFrames{2};
+// Bounds the time for which answers wait for those of calls that came with theirs.
+constexpr std::size_t kMostHeldBytes = 4096;
 
 }  // namespace
 
@@ -104,7 +106,10 @@ bool SocketConnection::runFrames() {
     }
     switch (_reader.next(frame)) {
       case wire::FrameReader::Next::frame:
+        // The answers of calls that came together go together.
+        if (_reader.frameWaits()) _out->hold();
         if (!runFrame(frame)) return false;
+        if (_out->waitingBytes() > kMostHeldBytes) _out->flush();
         break;
       case wire::FrameReader::Next::impossible:
         return violation(
@@ -206,8 +211,10 @@ std::optional<std::string> SocketConnection::runCall(const wire::Frame& frame, F
 std::optional<std::string> SocketConnection::dispatch(const wire::Frame& frame,
                                                       const std::string& extensionToken) {
   const bool large = frame.header.kind == wire::FrameKind::largeCall;
-  CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters,
-                    [this] { return overdue(); }};
+  CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters, [this] {
+                      _out->flush();
+                      return overdue();
+                    }};
   auto refusal = _observer ? dispatchQuestion(frame, *_observer, _out, memory)
                            : dispatchCall(frame, *_session, _out, memory, extensionToken);
   if (large) _reader.rest();  // its buffer is part of what the call was charged

@@ -31,6 +31,8 @@ class SocketReader : private wire::FrameMemory {
   std::optional<FileDescriptor> takeDescriptor();
   // True if there are descriptors that no frame has announced.
   bool strayDescriptors() const { return !_descriptors.empty() && _frames.empty(); }
+  // True if another whole frame has arrived.
+  bool frameWaits() const { return _frames.frameWaits(); }
   // True if the last receive() may have left bytes in the socket.
   bool moreLikely() const { return _moreLikely; }
   // True after noRoom if unfinished frames take all memory that they may, so that waiting is useless.

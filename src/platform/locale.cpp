@@ -59,12 +59,18 @@ std::optional<std::string> EnvironmentLocale::countryCode() {
   return _last ? countryOfLocaleName(*_last) : std::nullopt;
 }
 
+// Looks for a changed zone once a second, because tzset() asks the file system each time.
 int EnvironmentLocale::timeZoneOffset() {
-  ::tzset();  // localtime_r does not notice a changed zone
   const time_t now = ::time(nullptr);
+  const auto second = static_cast<std::uint32_t>(now);
+  const std::uint64_t known = _offset.load(std::memory_order_relaxed);
+  if (known >> 32 == second) return static_cast<std::int32_t>(known);
+  ::tzset();  // localtime_r does not notice a changed zone
   tm parts{};
   ::localtime_r(&now, &parts);
-  return static_cast<int>(parts.tm_gmtoff);
+  const auto offset = static_cast<std::int32_t>(parts.tm_gmtoff);
+  _offset.store(std::uint64_t{second} << 32 | static_cast<std::uint32_t>(offset), std::memory_order_relaxed);
+  return offset;
 }
 
 }  // namespace veltrad::platform

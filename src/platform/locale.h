@@ -2,6 +2,8 @@
 // The country of the current locale, and the offset of the local time zone. Any thread.
 #pragma once
 
+#include <atomic>
+#include <cstdint>
 #include <optional>
 #include <string>
 
@@ -33,6 +35,8 @@ class EnvironmentLocale final : public Locale {
   const std::string _path;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<std::string> _last GUARDED_BY(_mutex);
+  // A second since 1970 in the upper half, and the offset in that second in the lower half.
+  std::atomic<std::uint64_t> _offset{0};
 };
 
 // The country in a locale name. Exposed for tests.

@@ -29,6 +29,8 @@ void shareHeaps() {
   mallopt(M_ARENA_MAX, 2);
   // Large blocks are returned when they are freed; otherwise glibc would raise the threshold with each.
   mallopt(M_MMAP_THRESHOLD, 256 << 10);
+  // What a post needs is freed after each post; returning it each time would cost a page fault for each page.
+  mallopt(M_TRIM_THRESHOLD, 1 << 20);
 }
 
 void returnFreeMemory() {

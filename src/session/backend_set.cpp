@@ -73,11 +73,13 @@ std::vector<std::string> reportingNames(const BackendSet& backends) {
 
 std::int32_t hierarchyOf(const BackendSet* backends) {
   if (!backends) return 0;
-  for (const char* name : {wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendHTTPPost}) {
-    const auto at = backends->find(name);
-    if (at != backends->end()) return at->second->hierarchy();
+  std::int32_t hierarchy = 0;
+  // A set has few back ends, and comparing lengths first is faster than searching for names.
+  for (const auto& [name, backend] : *backends) {
+    if (name == std::string_view(wire::kVeltraBackendHTTPPost2)) return backend->hierarchy();
+    if (name == std::string_view(wire::kVeltraBackendHTTPPost)) hierarchy = backend->hierarchy();
   }
-  return 0;
+  return hierarchy;
 }
 
 void syncReportingStates(const BackendSet& backends, const BackendSet* parents) {

@@ -39,7 +39,8 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   forbidByWord(*set, making.word);
   for (const auto& [name, backend] : *set) {
     const auto [decision, answer] =
-        backend->sendMessage(message.payload, time, message.category, message.type, 0);
+        backend->sendMessage(message.payload ? std::optional(*message.payload) : std::nullopt, time,
+                             message.category, message.type, 0);
     if (message.outcomes) message.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }

@@ -9,13 +9,16 @@
 
 namespace veltrad::session {
 
-std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
+std::optional<std::string> offerToBackends(const BackendSet& backends, Message message,
                                            support::MessageLog& messageLog, wire::Outcomes* outcomes) {
   std::optional<std::string> result;
   if (outcomes) outcomes->reserve(backends.size());
-  for (const auto& [name, backend] : backends) {
+  for (auto next = backends.begin(); next != backends.end();) {
+    const auto& [name, backend] = *next++;
+    // The last one owns the payload alone, so that it need not copy what it changes.
+    auto payload = next == backends.end() ? std::move(message.payload) : message.payload;
     auto [decision, answer] =
-        backend->sendMessage(message.payload, message.time, message.category, message.type, message.flag);
+        backend->sendMessage(std::move(payload), message.time, message.category, message.type, message.flag);
     if (outcomes) outcomes->push_back({name, decision});
     if (!answer) continue;
     messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);

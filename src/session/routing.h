@@ -15,7 +15,7 @@ namespace veltrad::session {
 class FlushCounters;
 
 struct Message {
-  const Dictionary* payload = nullptr;
+  std::optional<Dictionary> payload;
   platform::TimeValue time;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
@@ -24,7 +24,7 @@ struct Message {
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.
 // Adds what became of it to `outcomes`, unless that is null because nobody waits for it.
-std::optional<std::string> offerToBackends(const BackendSet& backends, const Message& message,
+std::optional<std::string> offerToBackends(const BackendSet& backends, Message message,
                                            support::MessageLog& messageLog, wire::Outcomes* outcomes);
 
 // Calls `completion`, which may be empty, once: at the first error, or when all back ends have answered.

@@ -214,7 +214,7 @@ void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16
 void VeltradSession::sendMessageWithDictionary(Dictionary message, wire::SentReply reply) {
   logDebug("sendMessageWithCategory: Sending message for session %u", _sessionID);
   wire::Outcomes outcomes;
-  auto answer = sendMessageWithDictionary(message, reply ? &outcomes : nullptr, Origin::client);
+  auto answer = sendMessageWithDictionary(std::move(message), reply ? &outcomes : nullptr);
   if (reply) reply(std::move(answer), std::move(outcomes));
 }
 
@@ -227,56 +227,54 @@ void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
                                                                    wire::Outcomes* outcomes, Origin origin) {
-  Dictionary message{{wire::kVeltraMessageParametersCategory, unsigned{category}},
-                     {wire::kVeltraMessageParametersFlag, 0u},
-                     {wire::kVeltraMessageParametersType, unsigned{type}}};
-  if (payload) message.set(wire::kVeltraMessageParametersPayload, std::move(*payload));
-  return sendMessageWithDictionary(message, outcomes, origin);
+  if (!hasBackends(origin)) return std::nullopt;
+  return sendMessage({std::move(payload), {}, category, type, 0}, outcomes);
 }
 
-std::optional<std::string> VeltradSession::sendMessageWithDictionary(const Dictionary& message,
-                                                                     wire::Outcomes* outcomes,
-                                                                     Origin origin) {
-  hearOwner();
-  if (!_backends) {
-    logDebug("sendMessageWithDictionary: No backends available to send message");
-    if (origin == Origin::client) {
-      _services.counters.count(wire::Reason::no_backends);
-    }
-    return std::nullopt;
-  }
-  const auto category = message.uint32(wire::kVeltraMessageParametersCategory);
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary message,
+                                                                     wire::Outcomes* outcomes) {
+  if (!hasBackends(Origin::client)) return std::nullopt;
+  const auto category = message.uint16(wire::kVeltraMessageParametersCategory);
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
     _services.counters.count(wire::Reason::no_category);
     return std::nullopt;
   }
-  const auto type = message.uint32(wire::kVeltraMessageParametersType);
+  const auto type = message.uint16(wire::kVeltraMessageParametersType);
   if (!type) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
     _services.counters.count(wire::Reason::no_type);
     return std::nullopt;
   }
-  const auto category16 = static_cast<std::uint16_t>(*category);
-  const auto type16 = static_cast<std::uint16_t>(*type);
+  const std::int32_t flag = message.int32(wire::kVeltraMessageParametersFlag).value_or(0);
+  auto payload = message.takeDictionary(wire::kVeltraMessageParametersPayload);
+  return sendMessage({std::move(payload), {}, *category, *type, flag}, outcomes);
+}
+
+bool VeltradSession::hasBackends(Origin origin) {
+  hearOwner();
+  if (_backends) return true;
+  logDebug("sendMessageWithDictionary: No backends available to send message");
+  if (origin == Origin::client) _services.counters.count(wire::Reason::no_backends);
+  return false;
+}
+
+// Sets the message's time. There are back ends.
+std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Outcomes* outcomes) {
   std::optional<Dictionary> changed;
-  const Dictionary* payload =
-      _word.allowed(message.dictionary(wire::kVeltraMessageParametersPayload), changed);
-  const auto flag = static_cast<std::int32_t>(message.uint32(wire::kVeltraMessageParametersFlag).value_or(0));
-  const platform::TimeValue time = _services.clock.now();
+  if (message.payload) _word.allowed(&*message.payload, changed);
+  if (changed) message.payload = std::move(changed);
+  message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
   sayWithoutUserInfo();
   const std::int32_t hierarchy = hierarchyOf(_backends.get());
-  if (hierarchy > 0 || _aggregation->active()) {
-    aggregateMessage(hierarchy, platform::timevalToSeconds(time), category16, type16, payload);
-  }
-  return offerToBackends(*_backends, {payload, time, category16, type16, flag}, _services.messageLog,
-                         outcomes);
+  if (hierarchy > 0 || _aggregation->active()) aggregateMessage(hierarchy, message);
+  return offerToBackends(*_backends, std::move(message), _services.messageLog, outcomes);
 }
 
 void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_t method,
                                          std::uint16_t respCode) {
-  sendMessageWithCategory(method, respCode, wire::OptionalDictionary(payload), nullptr, Origin::session);
+  sendMessageWithCategory(method, respCode, payload, nullptr, Origin::session);
   logDebug("internalSendMessage: Sent internal message (method:%d respCode:%d)", method, respCode);
 }
 
@@ -288,13 +286,14 @@ void VeltradSession::sayWithoutUserInfo() {
   logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", _sessionID);
 }
 
-void VeltradSession::aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category,
-                                      std::uint16_t type, const Dictionary* payload) {
+void VeltradSession::aggregateMessage(std::int32_t hierarchy, const Message& message) {
   const FamilyPlace place{*_aggregation, _userInfo, hierarchy};
   // A root has no ancestors, so it does not need the families' lock.
   const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
   if (!toAncestor && !_aggregation->active()) return;
-  const std::string copy = aggregatedCopy(_sessionInfo, _sentUserInfo, timestamp, category, type, payload);
+  const std::string copy =
+      aggregatedCopy(_sessionInfo, _sentUserInfo, platform::timevalToSeconds(message.time), message.category,
+                     message.type, message.payload ? &*message.payload : nullptr);
   CopySent sent;
   if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
   if (!sent.taken) sent = _aggregation->sendToAggregator(copy);

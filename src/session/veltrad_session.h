@@ -28,6 +28,7 @@ class Aggregation;
 class FlushCounters;
 class VeltradSessionDelegate;
 struct FamilyFacts;
+struct Message;
 
 // What every session uses. It outlives the sessions.
 struct SessionServices {
@@ -92,17 +93,19 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void keepUserInfo(backends::SharedDictionary info);
   // Messages of the session itself are not counted as lost.
   enum class Origin { client, session };
-  // These check the message, pass it to the aggregating client and every back end, and return the answer for
-  // the client. `outcomes` is null if nobody waits for them.
+  // Hears the owner's word first.
+  bool hasBackends(Origin origin);
+  // These check the message and return the answer for the client. `outcomes` is null if nobody waits for
+  // them.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      wire::OptionalDictionary payload,
                                                      wire::Outcomes* outcomes,
                                                      Origin origin = Origin::client);
-  std::optional<std::string> sendMessageWithDictionary(const Dictionary& message, wire::Outcomes* outcomes,
-                                                       Origin origin);
+  std::optional<std::string> sendMessageWithDictionary(Dictionary message, wire::Outcomes* outcomes);
+  // Passes the message to the aggregating client and every back end.
+  std::optional<std::string> sendMessage(Message message, wire::Outcomes* outcomes);
   void sayWithoutUserInfo();
-  void aggregateMessage(std::int32_t hierarchy, double timestamp, std::uint16_t category, std::uint16_t type,
-                        const Dictionary* payload);
+  void aggregateMessage(std::int32_t hierarchy, const Message& message);
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
 
   FamilyFacts familyFacts() const;

@@ -71,6 +71,14 @@ class Deflation {
   }
   // Makes a used stream as good as new.
   bool beginAnew() { return deflateReset(&stream) == Z_OK; }
+  // Room for the output, which is kept too, up to a limit.
+  std::string& roomFor(std::size_t bytes) {
+    if (_room.size() < bytes) _room.resize(bytes);
+    return _room;
+  }
+  void limitRoom() {
+    if (_room.size() > kPieceBytes) _room = std::string();
+  }
   void give(const char* bytes, std::size_t count) {
     stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes));  // zlib only reads them
     stream.avail_in = static_cast<uInt>(count);
@@ -91,6 +99,7 @@ class Deflation {
 
  private:
   bool _begun = false;
+  std::string _room;
 };
 
 namespace {
@@ -166,15 +175,16 @@ std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes,
   }
   Deflation& deflation = *taken;
   deflation.give(bytes.data(), bytes.size());
-  std::string output(deflateBound(&deflation.stream, bytes.size()), '\0');
-  int result = deflation.run(Z_FINISH, output);
+  std::string& room = deflation.roomFor(deflateBound(&deflation.stream, bytes.size()));
+  int result = deflation.run(Z_FINISH, room);
   if (result == Z_OK) result = deflate(&deflation.stream, Z_FINISH);  // fails, since no room is left
   if (result != Z_STREAM_END) {
     deflation.sayFailure(result);
     return std::nullopt;
   }
-  output.resize(deflation.stream.total_out);
-  output.shrink_to_fit();  // it may wait for a server for a long time
+  // A copy of exactly its length, because it may wait for a server for a long time.
+  std::string output(room.data(), deflation.stream.total_out);
+  deflation.limitRoom();
   sayCompressed(bytes.size(), output.size());
   const Lock held(_mutex);
   _kept.swap(taken);

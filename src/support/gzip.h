@@ -15,8 +15,9 @@ namespace veltrad::support {
 
 class Deflation;
 
-// Compresses texts. Keeps one stream of zlib (some 270 KB) between them, because memory that is taken from
-// the system and returned for each text costs dozens of page faults. Any thread.
+// Compresses texts. Keeps one stream of zlib (some 270 KB) and up to 128 KiB of room for its output between
+// them, because memory that is taken from the system and returned for each text costs dozens of page faults.
+// Any thread.
 class GzipCompressor {
  public:
   GzipCompressor();

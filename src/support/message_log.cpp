@@ -62,14 +62,14 @@ std::optional<double> creationDate(const std::string& path) {
   return static_cast<double>(number);
 }
 
-std::string filled(std::string_view format, std::initializer_list<std::string_view> values) {
-  std::string text;
+void appendFilled(std::string& text, std::string_view format,
+                  std::initializer_list<std::string_view> values) {
   for (const std::string_view value : values) {
     const std::size_t place = format.find("%@");
     text.append(format.substr(0, place)).append(value);
     format.remove_prefix(place + 2);
   }
-  return text.append(format);
+  text.append(format);
 }
 
 std::string createdText(const std::optional<double>& created) {
@@ -92,8 +92,15 @@ MessageLog::MessageLog(const platform::Clock& clock, std::string directory, plat
 
 void MessageLog::put(std::string_view format, std::initializer_list<std::string_view> values) {
   const double now = platform::timevalToSeconds(_clock.now());
-  std::string line = filled(format, values);
-  line.insert(0, "(" + dateDescription(now) + ") ").push_back('\n');
+  constexpr std::size_t kDate = 40;
+  std::size_t length = kDate + format.size();
+  for (const std::string_view value : values) length += value.size();
+  // Made in one piece, because a value may be a whole post.
+  std::string line;
+  line.reserve(length);
+  line.append("(").append(dateDescription(now)).append(") ");
+  appendFilled(line, format, values);
+  line.push_back('\n');
   const std::size_t bytes = line.size() + kLineBytes;
   using Put = platform::DiskWriter::Queue::Put;
   switch (_queue.put(

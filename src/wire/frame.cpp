@@ -88,6 +88,12 @@ void FrameReader::rest() {
   if (_capacity > wanted + wanted / 2 + kIdleReadBytes) resizeBuffer(wanted);
 }
 
+bool FrameReader::frameWaits() const {
+  const std::size_t available = _filled - _taken;
+  if (available < kFrameHeaderBytes) return false;
+  return decodeFrameHeader(_buffer.get() + _taken).bodyLength <= available - kFrameHeaderBytes;
+}
+
 FrameReader::Next FrameReader::next(Frame& frame) {
   if (_impossible) return Next::impossible;
   if (_toSkip) return skip(frame);

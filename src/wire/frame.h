@@ -78,6 +78,8 @@ class FrameReader {
   void received(std::size_t count) { _filled += count; }
   // The next whole frame. `impossible` is final; the first time, `frame` holds the header in question.
   Next next(Frame& frame);
+  // True if next() will return a frame.
+  bool frameWaits() const;
   // True if everything that was received has been handed out.
   bool empty() const { return _taken == _filled && !_toSkip; }
   // Shrinks the buffer to its content. To be called when nothing more is expected soon.

@@ -13,7 +13,7 @@ namespace {
 
 struct Counting final : backends::VeltraBackend {
   explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
-  backends::Sent sendNumberedMessage(const backends::NumberedMessage& message) override {
+  backends::Sent sendNumberedMessage(backends::NumberedMessage&& message) override {
     return {{}, std::to_string(message.eventID)};
   }
 };
@@ -21,10 +21,10 @@ struct Counting final : backends::VeltraBackend {
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
   FakeRandom random;
   const auto backend = std::make_shared<Counting>(random);
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "1");
-  for (int i = 2; i < 65'536; ++i) backend->sendMessage(nullptr, {}, 0, 0, 0);
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "0");
-  EXPECT_EQ(backend->sendMessage(nullptr, {}, 0, 0, 0).text, "1");
+  EXPECT_EQ(backend->sendMessage(std::nullopt, {}, 0, 0, 0).text, "1");
+  for (int i = 2; i < 65'536; ++i) backend->sendMessage(std::nullopt, {}, 0, 0, 0);
+  EXPECT_EQ(backend->sendMessage(std::nullopt, {}, 0, 0, 0).text, "0");
+  EXPECT_EQ(backend->sendMessage(std::nullopt, {}, 0, 0, 0).text, "1");
   for (const auto& [text, major, minor] :
        {std::tuple{"9.3", 9, 3}, {"10", 10, 0}, {"300.1", 44, 1}, {"x.y", 0, 0}, {"8.0.7", 8, 0}}) {
     const auto version = backends::SelfVersion::of(text);

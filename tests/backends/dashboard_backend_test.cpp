@@ -64,7 +64,7 @@ class Dashboard : public ::testing::Test {
   // A message that nobody acknowledges, and the end of its back end.
   void sendAndEnd(std::shared_ptr<platform::MemoryAccount> account) {
     const auto backend = make({{"reliable", 60'000}}, std::move(account));
-    backend->sendMessage(nullptr, kTime, 1, 1, 0);
+    backend->sendMessage(std::nullopt, kTime, 1, 1, 0);
     backend->cleanup();
   }
   static std::ptrdiff_t entries(const char* directory) {
@@ -101,7 +101,7 @@ TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
       {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
   for (const auto& [backend, flags] : cases) {
-    const auto [decision, line] = backend->sendNumberedMessage({&payload, kTime, 1, 0, 5, 0});
+    const auto [decision, line] = backend->sendNumberedMessage({payload, kTime, 1, 0, 5, 0});
     EXPECT_EQ(decision.fate, (flags & 1) ? wire::Fate::waiting : wire::Fate::sent);
     EXPECT_EQ(server.receive(), "\x02\x07\x01\x1E\x53\x72\x4E\x00\xFF\xFF\xED\xCB\xFF\xFC\xFF\xA6\0\1\0\0"s +
                                     kDevice + "\0\5\0"s + flags + " codec=opus with 18 chars");
@@ -133,7 +133,7 @@ TEST_F(Dashboard, ThePayloadBecomesText) {
            {{{"key", longText + "=\xC3\xA9"}, {"z", longText + "later"}},
             " key=" + longText + "\\=\xC3",
             1}}) {
-    const auto line = backend->sendMessage(&c.payload, kTime, 65'535, 0, 0).text;
+    const auto line = backend->sendMessage(c.payload, kTime, 65'535, 0, 0).text;
     EXPECT_EQ(server.receive().substr(64), c.text);
     EXPECT_TRUE(line && line->ends_with(" 65535     0 " + c.text.substr(0, c.text.size() - c.lostByTheLine)));
   }
@@ -171,7 +171,7 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   for (int i = 0; i < 5; ++i) sendAndEnd(account);  // three fit
   EXPECT_EQ(world.counters.value(wire::Reason::no_memory_to_linger), 2u);
   const auto backend = make({{"reliable", 60'000}}, account);
-  for (int i = 0; i < 20; ++i) backend->sendMessage(nullptr, kTime, 1, 1, 0);
+  for (int i = 0; i < 20; ++i) backend->sendMessage(std::nullopt, kTime, 1, 1, 0);
   EXPECT_GT(world.counters.value(wire::Reason::no_memory_to_await), 5u);
   EXPECT_EQ(world.counters.value(wire::Reason::datagram_sent), 25u);
 

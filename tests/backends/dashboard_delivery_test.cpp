@@ -69,7 +69,9 @@ TEST(DashboardDelivery, SoManyWaitAndTheOldestMakesRoom) {
     for (int event = 0; event <= most; ++event) {
       const auto pushedOut = queue.tryToSendMsg(std::to_string(event), 1, platform::Charge()).pushedOut;
       EXPECT_EQ(pushedOut.has_value(), event == most);
-      if (pushedOut) EXPECT_NE(entryOf(*pushedOut).text.find(std::to_string(most)), std::string_view::npos);
+      if (pushedOut) {
+        EXPECT_NE(entryOf(*pushedOut).text.find(std::to_string(most)), std::string_view::npos);
+      }
     }
     ++network.now;
     EXPECT_EQ(queue.tick().sent, std::size_t(most));

@@ -58,6 +58,23 @@ TEST(Dictionary, keepsKeysInOrder) {
   EXPECT_EQ(dictionary.find("b"), nullptr);
 }
 
+TEST(Dictionary, sharesEntriesUntilOneOfItsCopiesChanges) {
+  const Dictionary first{{"a", Dictionary{{"x", 1}}}, {"b", "a text that is too long for a string itself"}};
+  Dictionary set = first, erased = first, merged = first, taken = first, moved = first;
+  EXPECT_EQ(set.find("b"), first.find("b"));
+  set.set("b", 2);
+  erased.erase("a");
+  merged.merge({{"a", 3}, {"c", 4}});
+  EXPECT_EQ(taken.takeDictionary("a")->int32("x"), 1);
+  EXPECT_EQ(std::move(moved).takeEntries().size(), 2u);
+  EXPECT_EQ(formats::writeJSON(first), R"({"a":{"x":1},"b":"a text that is too long for a string itself"})");
+  EXPECT_EQ(set.int32("b"), 2);
+  EXPECT_EQ(erased.size(), 1u);
+  EXPECT_EQ(merged.int32("a"), 3);
+  EXPECT_EQ(merged.size(), 3u);
+  EXPECT_TRUE(taken.dictionary("a")->empty());
+}
+
 TEST(JSON, readsValues) {
   Value nested = Array{};
   for (int i = 1; i < 64; ++i) nested = Array{nested};
@@ -102,6 +119,24 @@ TEST(JSON, isWrittenInOrderAndMended) {
   EXPECT_EQ(formats::writeJSON(Dictionary{{"b", Array{1, 2.0}}, {"a", "x"}}), R"({"a":"x","b":[1,2.0]})");
   EXPECT_EQ(formats::writeJSON(Dictionary{{"a", 1}}, formats::JSONStyle::pretty), "{\n  \"a\": 1\n}");
   EXPECT_EQ(formats::writeJSON(Array{NAN, HUGE_VAL, "a\xFF"}), "[null,null,\"a\uFFFD\"]");
+  const Value nested = Array{Dictionary{}, Array{}, Dictionary{{"a", Array{true, Date{1.5}}}}};
+  EXPECT_EQ(formats::writeJSON(nested, formats::JSONStyle::pretty),
+            "[\n  {},\n  [],\n  {\n    \"a\": [\n      true,\n      {\n        \"$date\": 1.5\n      }\n    "
+            "]\n  }\n]");
+  // Each character that needs care at each place in a word of eight.
+  const std::pair<std::string, std::string> kEscapes[] = {
+      {"\"", "\\\""}, {"\\", "\\\\"},   {"\n", "\\n"},       {"\x1F", "\\u001F"},
+      {" ", " "},     {"\x7F", "\x7F"}, {"\u00e9", "\u00e9"}};
+  for (const auto& [character, escaped] : kEscapes) {
+    for (std::size_t before = 0; before < 17; ++before) {
+      for (const std::size_t after : {0u, 1u, 5u, 9u, 700u}) {
+        const std::string start(before, 'a'), end(after, '~');
+        EXPECT_EQ(formats::writeJSON(start + character + end), "\"" + start + escaped + end + "\"");
+        const Dictionary flat{{start + character, end}};
+        EXPECT_LE(formats::writeJSON(flat).size(), formats::jsonBytesAtMost(flat));
+      }
+    }
+  }
 }
 
 }  // namespace

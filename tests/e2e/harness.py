@@ -377,8 +377,9 @@ def storebag(version="v1", backends=None, **more):
 class SystemTest(unittest.TestCase):
     """A root directory, a lab that serves "quindle" and "ostvane", and daemons, which are stopped and checked at the end."""
     lab_arguments = ()
+    opened = ()  # the clients of the daemon that serves
+
     def setUp(self):
-        self.opened = []
         self.root = Root()
         self.addCleanup(self.root.remove)
         self.lab = Lab(*self.lab_arguments)
@@ -410,7 +411,7 @@ class SystemTest(unittest.TestCase):
             daemon.kill()  # so that the next row of a table can start its own
             raise
         finally:
-            opened, self.opened = self.opened, []
+            opened, self.opened = self.opened, ()
         daemon.stop()
         for ctl in opened:  # else it would come back to the next daemon
             ctl.kill()
@@ -419,7 +420,7 @@ class SystemTest(unittest.TestCase):
         """Starts a session with veltractl; returns it and the answer to its start."""
         ctl = Ctl(self.root, *arguments, **options)
         self.addCleanup(ctl.kill)
-        self.opened.append(ctl)
+        self.opened = (*self.opened, ctl)
         answer = ctl.answer(deadline)
         self.assertEqual(answer["op"], "start")
         return ctl, answer["backends"]

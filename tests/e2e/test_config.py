@@ -23,6 +23,7 @@ KEYS = (
     ("httpsRealtimePostURL", {"https://[::1]:8443": ...}, ("a.example",), "https", True),
     ("uuidOverrideDNU", {UUID: ...}, ("x", UUID + "0"), "UUID", True),
     ("uuidRespectDNU", {UUID: ...}, (UUID.replace("-", "0"),), "UUID", True),
+    ("ReportingOff", {"true": True}, ("off",), "true or false", True),
     ("veltra_storebag_url", {"https://bags.example/maple": ...}, ("ftp://bags.example", "https://b\u00fc.example"), "https", False),
     ("com.florn.timed/TMAutomaticTimeZoneEnabled", {"false": False}, ("0",), "true or false", True),
 )

@@ -104,6 +104,37 @@ struct GatedDoor : Door {
   Gate gate;
 };
 
+// A session whose start waits at a gate.
+class StartingSession final : public AnsweringSession {
+ public:
+  explicit StartingSession(Gate& gate) : _gate(gate) {}
+  void startConfigWithCompletionHandler(wire::NamesReply reply) override {
+    _gate.pass();
+    AnsweringSession::startConfigWithCompletionHandler(std::move(reply));
+  }
+
+ private:
+  Gate& _gate;
+};
+
+struct StartingDoor : Door {
+  bool listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) override {
+    connection->setExportedObject(std::make_shared<StartingSession>(gate));
+    connection->resume();
+    return true;
+  }
+  Gate gate;
+};
+
+TEST(Replies, OfCallsThatCameTogetherDoNotWaitForOneThatBlocks) {
+  StartingDoor door;
+  WireEnd client = door.client();
+  client.send(messageFrame(1) + messageFrame(2) + callFrame(3, operation::kStartConfig) + messageFrame(4));
+  for (const std::uint32_t answered : {1u, 2u}) EXPECT_EQ(client.next().callID, answered);
+  door.gate.open();
+  for (const std::uint32_t answered : {3u, 4u}) EXPECT_EQ(client.next().callID, answered);
+}
+
 TEST(Replies, FromElsewhereThatNobodyReadsEndTheConnection) {
   Door door;
   std::vector<wire::SentReply> held;

@@ -22,7 +22,7 @@ AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters,
                              const std::string& name, const std::string& productFamily)
     : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
-Sent AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent AmperyBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
     return {{wire::Fate::dropped, *forbidden}, std::nullopt};
@@ -33,7 +33,7 @@ Sent AmperyBackend::sendNumberedMessage(const NumberedMessage& message) {
     _counters.count(why);
     return {{wire::Fate::none, why}, std::nullopt};
   }
-  Dictionary event = *message.payload;
+  Dictionary event = *std::move(message.payload);
   event.merge({{"event", unsigned{message.eventID}},
                {"method", unsigned{message.method}},
                {"respCode", unsigned{message.respCode}}});

@@ -20,7 +20,7 @@ class AmperyBackend final : public VeltraBackend {
                                                      const std::string& productFamily);
 
   // The event is the payload with "method", "respCode" and "event" (the event ID) set. Returns no text.
-  Sent sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(NumberedMessage&& message) override;
 
  private:
   AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,

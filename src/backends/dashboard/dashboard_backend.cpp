@@ -162,7 +162,7 @@ DashboardBackend::~DashboardBackend() {
   cleanup();
 }
 
-Sent DashboardBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
     return {{wire::Fate::dropped, *forbidden}, std::nullopt};
@@ -210,7 +210,7 @@ bool DashboardBackend::uploadLogData(const Array& logData) {
   const auto location = _uploads.upload(_postURL, logData);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
-  sendMessage(&payload, _clock.now(), 0, 2, 0);
+  sendMessage(payload, _clock.now(), 0, 2, 0);
   return true;
 }
 

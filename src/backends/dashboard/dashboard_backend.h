@@ -55,7 +55,7 @@ class DashboardBackend final : public VeltraBackend {
   ~DashboardBackend() override;
 
   // The text is the dashboard text line of the message.
-  Sent sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(NumberedMessage&& message) override;
   bool uploadLogData(const Array& logData) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;

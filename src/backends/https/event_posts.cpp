@@ -47,10 +47,10 @@ void EventPosts::restrict(Dictionary& event) const {
 }
 
 JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> events,
-                                                       const std::string& clientID, bool wantPretty) const {
+                                                       const std::string& clientID, bool wantPretty,
+                                                       std::size_t expectedBytes) const {
   const double postTime = platform::timevalToSeconds(_clock.now());
-  for (Dictionary& event : events) restrict(event);
-  return makeJSONMessage(postTime, clientID, std::move(events), wantPretty);
+  return makeJSONMessage(postTime, clientID, std::move(events), wantPretty, expectedBytes);
 }
 
 std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,

@@ -39,8 +39,9 @@ class EventPosts {
 
   // Removes and counts fields that JSON cannot represent.
   void restrict(Dictionary& event) const;
+  // The events have been restricted. `expectedBytes` as for writeJSON.
   JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
-                                             bool wantPretty) const;
+                                             bool wantPretty, std::size_t expectedBytes) const;
   // The post keeps the back end alive. A status of 5xx disables the back end. Returns why the post has not
   // begun, if it has not.
   std::optional<wire::Reason> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,

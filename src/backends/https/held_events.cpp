@@ -55,7 +55,8 @@ void HeldEvents::setSessionID(const std::string& sessionID) {
 
 HeldEvents::Taken HeldEvents::take() {
   const Lock held(_mutex);
-  return {_batch.take(), std::move(_charge)};
+  const std::size_t jsonBytes = _batch.jsonBytes();
+  return {_batch.take(), std::move(_charge), jsonBytes};
 }
 
 std::size_t HeldEvents::discard() {

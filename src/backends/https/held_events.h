@@ -24,6 +24,8 @@ class HeldEvents final : public platform::Evictable {
   struct Taken {
     std::vector<Dictionary> events;
     platform::Charge charge;
+    // An upper bound on the events' JSON texts.
+    std::size_t jsonBytes = 0;
   };
   // Before the next event: there is room, its method's threshold requires a flush, or the batch is full.
   enum class Need { room, flush, bound };

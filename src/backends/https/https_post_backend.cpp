@@ -76,7 +76,7 @@ BackendActivity HTTPSPostBackend::activity() const {
   return activity;
 }
 
-Sent HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
+Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const StateVerdict verdict = stateVerdict(); verdict.state == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
     return {{wire::Fate::dropped, verdict.reason}, std::nullopt};
@@ -86,20 +86,18 @@ Sent HTTPSPostBackend::sendNumberedMessage(const NumberedMessage& given) {
   const std::uint64_t sessionIDChanges = _held->sessionIDChanges();
   const auto facts = this->facts();
   const bool batching = _clientState.batchEvents(*facts);
-  NumberedMessage message = given;
-  Dictionary stopPayload;
   if (message.respCode == kSessionTypeStop) {
     logDebug(
         "HTTPSPostBackend(sendMessage): Adding dnu type and sampling threshold to SESSION_TYPE_STOP message "
         "dictionary");
     if (message.payload) {
-      stopPayload = withStopFields(*message.payload, batching);
-      message.payload = &stopPayload;
+      addStopFields(*message.payload, batching);
     } else {
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
-  Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
+  Dictionary event =
+      createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   filterEvent(event);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
@@ -132,15 +130,14 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
            facts.requireUserInfo);
   _posts.restrict(event);
   std::optional<platform::Charge> charge{std::in_place};
-  if (facts.account) {
-    charge = facts.account->tryCharge(sizeOfEvent(event).charged, platform::MemoryUse::kept);
-  }
+  const EventSize size = sizeOfEvent(event);
+  if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
   if (!charge) {
     return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
   }
   std::vector<Dictionary> events;
   events.push_back(std::move(event));
-  JSONMessage posted = createMessage(std::move(events), facts);
+  JSONMessage posted = createMessage(std::move(events), facts, size.json);
   std::optional<std::string> result = std::move(posted.pretty);
   if (flushed) {
     result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + result.value_or("(null)");
@@ -155,16 +152,14 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   return {{wire::Fate::posted, why}, std::move(result)};
 }
 
-Dictionary HTTPSPostBackend::withStopFields(const Dictionary& payload, bool batching) const {
+void HTTPSPostBackend::addStopFields(Dictionary& payload, bool batching) const {
   Dictionary fields{{"Batch", batching ? 1u : 0u}, {"Opt", _clientState.identity().dnuType()}};
   const auto orMinusOne = [](const std::optional<double>& number) {
     return number ? Value(*number) : Value(-1);
   };
   fields.set("OverrideSampling", orMinusOne(_clientState.overrideSampling()));
   fields.set("SamplingThreshold", orMinusOne(samplingThreshold()));
-  Dictionary extended = payload;
-  extended.merge(fields);
-  return extended;
+  payload.merge(fields);
 }
 
 void HTTPSPostBackend::filterEvent(Dictionary& event) const {
@@ -236,9 +231,15 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
       _posts.refusePost(*this, count, completion);
       return std::nullopt;
     }
-    for (Dictionary& event : taken.events) event.merge(filtered);
+    // The events themselves were restricted when they were batched.
+    const bool restricts = !fitsJSON(filtered);
+    for (Dictionary& event : taken.events) {
+      event.merge(filtered);
+      if (restricts) _posts.restrict(event);
+    }
+    taken.jsonBytes += count * sizeOfEvent(filtered).json;
   }
-  JSONMessage posted = createMessage(std::move(taken.events), *facts);
+  JSONMessage posted = createMessage(std::move(taken.events), *facts, taken.jsonBytes);
   std::optional<std::string> pretty = std::move(posted.pretty);
   FlushCompletion whenPosted;
   std::size_t completionBytes = 0;
@@ -255,10 +256,13 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   return pretty;
 }
 
-JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const {
+JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
+                                            std::size_t eventBytes) const {
+  constexpr std::size_t kEnvelope = 128;
   const PostIdentity& identity = _clientState.identity();
-  return _posts.createMessageForPostAndLogging(std::move(events), identity.clientIdentifier(facts.device),
-                                               identity.loggingAllowed());
+  const std::string& client = identity.clientIdentifier(facts.device);
+  return _posts.createMessageForPostAndLogging(std::move(events), client, identity.loggingAllowed(),
+                                               kEnvelope + client.size() + eventBytes);
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {

@@ -35,7 +35,7 @@ class HTTPSPostBackend final : public VeltraBackend {
       const std::optional<std::string>& productFamily);
 
   void updateState() override;
-  Sent sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(NumberedMessage&& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
   BackendActivity activity() const override;
@@ -48,13 +48,15 @@ class HTTPSPostBackend final : public VeltraBackend {
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
                    std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
-  Dictionary withStopFields(const Dictionary& payload, bool batching) const;
+  void addStopFields(Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;
   Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message);
-  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts) const;
+  // `eventBytes` is an upper bound on the events' JSON texts.
+  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
+                            std::size_t eventBytes) const;
 
   platform::Locale& _locale;
   platform::Counters& _counters;

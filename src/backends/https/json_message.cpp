@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <cmath>
 
 #include "base/text.h"
@@ -55,6 +56,11 @@ double finiteOrMinusOne(double seconds) {
   return std::isfinite(seconds) ? seconds : -1.0;
 }
 
+bool fitsJSON(const Dictionary& event) {
+  return std::all_of(event.begin(), event.end(),
+                     [](const auto& entry) { return fateOf(entry.second) == Fate::keep; });
+}
+
 std::size_t restrictEventForJSON(Dictionary& event) {
   std::vector<Dictionary::Entry> changed;
   for (const auto& [key, value] : event) {
@@ -81,16 +87,16 @@ std::size_t restrictEventForJSON(Dictionary& event) {
 }
 
 JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
-                            bool wantPretty) {
+                            bool wantPretty, std::size_t expectedBytes) {
   Array list;
   list.reserve(events.size());
   for (Dictionary& event : events) list.emplace_back(std::move(event));
   const Value envelope = Dictionary{
       {"clientId", clientID}, {"events", std::move(list)}, {"postTime", finiteOrMinusOne(postTime)}};
-  JSONMessage message{formats::writeJSON(envelope), std::nullopt};
+  JSONMessage message{formats::writeJSON(envelope, formats::JSONStyle::compact, expectedBytes), std::nullopt};
   if (wantPretty)
     message.pretty = formats::writeJSON(envelope, formats::JSONStyle::pretty,
-                                        message.compact.size() + message.compact.size() / 4);
+                                        message.compact.size() + message.compact.size() / 2);
   return message;
 }
 

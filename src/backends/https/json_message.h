@@ -18,8 +18,8 @@ double finiteOrMinusOne(double seconds);
 // line. Returns how many entries were removed.
 std::size_t restrictEventForJSON(Dictionary& event);
 
-// -1.0 in place of what JSON cannot express.
-double finiteOrMinusOne(double seconds);
+// True if restrictEventForJSON would change nothing.
+bool fitsJSON(const Dictionary& event);
 
 struct JSONMessage {
   std::string compact;
@@ -28,8 +28,8 @@ struct JSONMessage {
 };
 
 // {"postTime": seconds since 1970, "clientId": text, "events": [...]}. The events have been restricted. A
-// `postTime` that is not finite becomes -1.0.
+// `postTime` that is not finite becomes -1.0. `expectedBytes` as for writeJSON.
 JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
-                            bool wantPretty);
+                            bool wantPretty, std::size_t expectedBytes = 0);
 
 }  // namespace veltrad::backends

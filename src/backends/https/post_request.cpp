@@ -27,6 +27,7 @@ http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, st
   if (compression.level > 0) compressed = compression.gzip.gzipDeflate(json, compression.level);
   const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
   request.body = useCompressed ? std::move(*compressed) : std::move(json);
+  request.body.shrink_to_fit();  // it may wait for a server for a long time
 
   auto& headers = request.headers;
   if (const SharedDictionary& userInfo = facts.sentUserInfo) {

@@ -37,7 +37,7 @@ void MivoBackend::loadAdaptor() {
   if (!_mivoAdaptor) logWarning("MivoBackend(initWithName): no Mivo adaptor: %s", failure.c_str());
 }
 
-Sent MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
+Sent MivoBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
     return {{wire::Fate::dropped, *forbidden}, std::nullopt};
@@ -47,8 +47,8 @@ Sent MivoBackend::sendNumberedMessage(const NumberedMessage& message) {
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
     return dropped(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
   }
-  const auto thrown =
-      _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode, message.payload);
+  const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode,
+                                            message.payload ? &*message.payload : nullptr);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());

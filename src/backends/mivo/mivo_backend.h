@@ -25,7 +25,7 @@ class MivoBackend final : public VeltraBackend {
   static bool isClientTypeAllowed(std::int32_t clientType) { return isAdaptorClientType(clientType); }
 
   // Passes on the payload, the method and the response code. Returns no text.
-  Sent sendNumberedMessage(const NumberedMessage& message) override;
+  Sent sendNumberedMessage(NumberedMessage&& message) override;
 
  private:
   MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
