@@ -180,6 +180,7 @@ std::size_t chargeOf(std::size_t memory, std::string_view body) {
 bool chargeCall(CallMemory& memory, std::size_t bytes) {
   auto charge = memory.account->tryCharge(bytes, platform::MemoryUse::working);
   if (!charge) {
+    memory.beforeWait();
     const auto last = std::chrono::steady_clock::now() + kLongestWaitForMemory;
     charge = memory.account->waitToCharge(
         bytes, [&] { return memory.giveUp() || std::chrono::steady_clock::now() >= last; });

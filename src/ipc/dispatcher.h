@@ -27,7 +27,9 @@ struct CallMemory {
   // Held until the call has run.
   platform::Charge charge;
   platform::Counters& counters;
-  // Returns true if the call must not wait any longer.
+  // Writes the replies that were held back; called before the call waits.
+  std::function<void()> beforeWait;
+  // Returns true if the call must not wait any longer. Called under the accounts' lock, so it takes none.
   std::function<bool()> giveUp;
   // Set if the call was counted and not run because there was no memory.
   bool usedUp = false;

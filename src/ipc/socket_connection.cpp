@@ -211,10 +211,8 @@ std::optional<std::string> SocketConnection::runCall(const wire::Frame& frame, F
 std::optional<std::string> SocketConnection::dispatch(const wire::Frame& frame,
                                                       const std::string& extensionToken) {
   const bool large = frame.header.kind == wire::FrameKind::largeCall;
-  CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters, [this] {
-                      _out->flush();
-                      return overdue();
-                    }};
+  CallMemory memory{_account, large ? _reader.takeLargeCharge() : platform::Charge(), _counters,
+                    [this] { _out->flush(); }, [this] { return overdue(); }};
   auto refusal = _observer ? dispatchQuestion(frame, *_observer, _out, memory)
                            : dispatchCall(frame, *_session, _out, memory, extensionToken);
   if (large) _reader.rest();  // its buffer is part of what the call was charged
