@@ -40,7 +40,7 @@ Seen feed(const std::uint8_t* bytes, std::size_t size, std::size_t piece) {
       bodies.emplace_back(frame.body);
       ipc::CallMemory memory{account,
                              *account->tryCharge(3 * frame.body.size(), platform::MemoryUse::working),
-                             counters, [] { return true; }};
+                             counters, [] {}, [] { return true; }};
       if (!ipc::dispatchCall(frame, session, out, memory) && !memory.usedUp) ++readable;
     }
   }
