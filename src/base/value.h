@@ -58,8 +58,8 @@ class Dictionary {
   // Adds or replaces. Linear in the number of entries after the key; use fromEntries for many entries.
   void set(std::string key, Value value);
   template <typename T>
-  void setIfPresent(std::string key, const std::optional<T>& value) {
-    if (value) set(std::move(key), *value);
+  void setIfPresent(std::string_view key, const std::optional<T>& value) {
+    if (value) set(std::string(key), *value);
   }
   // True if the key was present.
   bool erase(std::string_view key);
