@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // A session whose daemon goes away and comes back, and one in a forked child.
 #include <sys/wait.h>
+#include <unistd.h>
 
+#include <cstdlib>
 #include <filesystem>
 #include <iterator>
 
@@ -221,7 +223,9 @@ TEST(Fork, InACallbackEndsTheChildWithTheCallback) {
   std::promise<pid_t> forked;
   ASSERT_EQ(session.start([&](const veltra::Reply&) {
     const pid_t process = ::fork();
-    if (process != 0) forked.set_value(process);
+    if (process != 0) return forked.set_value(process);
+    // What the threads that the child lacks had allocated is no leak.
+    static_cast<void>(std::atexit([] { ::_exit(0); }));
   }),
             VELTRA_OK);
   int status = 1;
