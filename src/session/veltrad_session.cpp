@@ -101,7 +101,7 @@ void VeltradSession::hearOwner() {
     _sentUserInfo = _word.allowed(_userInfo);
     if (!_backends) continue;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
-    updateSessionWithDefaultSessionInfo();
+    _leftFamily ? forbidByWord(*_backends, _word.now()) : updateSessionWithDefaultSessionInfo();
   }
 }
 
@@ -149,8 +149,7 @@ void VeltradSession::updateSessionWithDefaultSessionInfo() {
     for (const auto& [name, backend] : *_backends) backend->updateState();
   }
   _sessionDelegate.updateDownstreamSessions(familyFacts());
-  // After the daemon was told of the back ends: a word that came before that is heard here, a later one
-  // there.
+  // After the daemon knows the back ends, so that it tells them of any later word.
   if (_backends) forbidByWord(*_backends, _word.now());
 }
 
@@ -362,6 +361,7 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
 
 void VeltradSession::end() {
   logDebug("dealloc: VeltradSession dealloc: %u", _sessionID);
+  _leftFamily = true;
   Dictionary payload;
   payload.setIfPresent("StorebagVersion", _storebagVersion);
   internalSendMessage(payload, 0, 1);

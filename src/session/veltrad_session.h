@@ -128,6 +128,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // What of it may leave the device.
   backends::SharedDictionary _sentUserInfo;
   HeardWord _word;
+  // It must not join its family again.
+  bool _leftFamily = false;
   std::shared_ptr<const BackendSet> _backends;
   std::optional<std::string> _storebagVersion;
 };
