@@ -43,7 +43,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
+                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
                                    const std::string& productFamily)
     : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
@@ -96,8 +96,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
-  Dictionary event =
-      createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
+  Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   filterEvent(event);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {

@@ -46,7 +46,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   void dropWaiting() override;
 
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                   std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
+                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+                   const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;

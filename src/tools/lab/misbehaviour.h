@@ -77,6 +77,7 @@ class Misbehaviour {
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);
   // Not seeded, so that every run draws the same numbers.
+  // NOLINTNEXTLINE(cert-msc51-cpp)
   std::minstd_rand _draw GUARDED_BY(_mutex);
   std::uint64_t _generation GUARDED_BY(_mutex) = 0;
   bool _stopped GUARDED_BY(_mutex) = false;
