@@ -59,7 +59,8 @@ std::string linesOf(const CommandLine& line, const std::string& complete, const 
     lines += fmt::format("{} -n {} -a {} -d {}\n", complete,
                          fishQuoted(before + "not __fish_seen_subcommand_from" + names), command.name,
                          fishQuoted(command.about));
-    lines += linesOf(command, complete, before + "__fish_seen_subcommand_from " + command.name);
+    lines +=
+        linesOf(command, complete, fmt::format("{}__fish_seen_subcommand_from {}", before, command.name));
   }
   return lines;
 }
