@@ -26,9 +26,10 @@ void VeltraBackend::updateState() {
 }
 
 Sent VeltraBackend::sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp,
-                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag) {
+                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag,
+                                const MessageNote& note) {
   ++_eventID;
-  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag});
+  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag, note});
 }
 
 Sent VeltraBackend::sendNumberedMessage(NumberedMessage&&) {
@@ -60,11 +61,10 @@ void VeltraBackend::setFacts(SharedFacts facts) {
   _facts.swap(facts);
 }
 
-void VeltraBackend::setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent) {
+void VeltraBackend::setUserInfoDict(const UserInfo& info) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
-  changed->userInfo = std::move(userInfo);
-  changed->sentUserInfo = std::move(sent);
+  changed->take(info);
   _facts = std::move(changed);
 }
 

@@ -9,6 +9,7 @@
 #include <string>
 
 #include "base/value.h"
+#include "config/field_changes.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::backends {
@@ -39,6 +40,13 @@ struct SelfVersion {
   std::uint8_t minor = 0;
 };
 
+// The user info as the client gave it, what of it may leave the device, and what differs. Each may be null.
+struct UserInfo {
+  SharedDictionary given;
+  SharedDictionary sent;
+  config::SharedEdits edits;
+};
+
 // The pointers may be null.
 struct SessionFacts {
   DeviceFacts device;
@@ -56,9 +64,17 @@ struct SessionFacts {
   SharedDictionary userInfo;
   // The same without what the owner of the device keeps back: this may leave.
   SharedDictionary sentUserInfo;
+  // What of the user info differs between the two.
+  config::SharedEdits userInfoEdits;
   std::optional<std::string> combinedSessionIDString;
   // Pays for what is kept.
   std::shared_ptr<platform::MemoryAccount> account;
+
+  void take(const UserInfo& info) {
+    userInfo = info.given;
+    sentUserInfo = info.sent;
+    userInfoEdits = info.edits;
+  }
 };
 using SharedFacts = std::shared_ptr<const SessionFacts>;
 

@@ -63,17 +63,17 @@ std::optional<std::string> FieldRules::digest(const Value& value) const {
   return hex({reinterpret_cast<const char*>(bytes), length});
 }
 
-bool FieldRules::apply(Dictionary& message, EditedFields& changes) const {
+bool FieldRules::apply(Dictionary& message, FieldChanges& changes) const {
   auto changed = empty() ? std::nullopt : edited(message, changes);
   if (changed) message = std::move(*changed);
   return changed.has_value();
 }
 
-void FieldRules::apply(Value& value, EditedFields& changes) const {
+void FieldRules::apply(Value& value, FieldChanges& changes) const {
   if (auto changed = edited(value, changes)) value = std::move(*changed);
 }
 
-std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, EditedFields& changes) const {
+std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, FieldChanges& changes) const {
   std::vector<Dictionary::Entry> entries;
   bool changed = false;
   for (const auto& [name, value] : dictionary) {
@@ -86,17 +86,17 @@ std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, Edite
     }
     changed = true;
     if (auto text = rule == Rule::hash ? digest(value) : std::nullopt) {
-      changes.hashed.insert(name);
+      changes.changed(FieldChange::hashed, name);
       entries.emplace_back(name, Value(std::move(*text)));
     } else {
-      changes.removed.insert(name);
+      changes.changed(FieldChange::removed, name);
     }
   }
   if (!changed) return std::nullopt;
   return Dictionary::fromEntries(std::move(entries));
 }
 
-std::optional<Value> FieldRules::edited(const Value& value, EditedFields& changes) const {
+std::optional<Value> FieldRules::edited(const Value& value, FieldChanges& changes) const {
   if (const Dictionary* dictionary = value.asDictionary()) {
     auto inner = edited(*dictionary, changes);
     return inner ? std::optional<Value>(std::move(*inner)) : std::nullopt;

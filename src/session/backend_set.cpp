@@ -82,6 +82,16 @@ std::int32_t hierarchyOf(const BackendSet* backends) {
   return hierarchy;
 }
 
+std::optional<std::string> displayURLOf(const BackendSet* backends) {
+  if (!backends) return std::nullopt;
+  for (const char* name :
+       {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendDashboard}) {
+    const auto at = backends->find(name);
+    if (at != backends->end() && at->second->displayURL()) return at->second->displayURL();
+  }
+  return std::nullopt;
+}
+
 void syncReportingStates(const BackendSet& backends, const BackendSet* parents) {
   for (const auto& [name, backend] : backends) {
     if (backend->ownVerdict().state == backends::kBackendHeld) continue;

@@ -12,22 +12,28 @@ bool HeardWord::hear() {
   return true;
 }
 
-backends::SharedDictionary HeardWord::allowed(const backends::SharedDictionary& userInfo) const {
-  std::optional<Dictionary> changed;
-  const Dictionary* sent = allowed(userInfo.get(), changed);
-  return sent == userInfo.get() ? userInfo : std::make_shared<const Dictionary>(std::move(*changed));
+backends::UserInfo HeardWord::allowed(backends::SharedDictionary userInfo) const {
+  backends::UserInfo info{userInfo, userInfo, nullptr};
+  if (!userInfo || !_word->fields) return info;
+  Dictionary sent = *userInfo;
+  auto edits = std::make_shared<config::EditedFields>();
+  if (!_word->fields->apply(sent, *edits)) return info;
+  info.sent = std::make_shared<const Dictionary>(std::move(sent));
+  info.edits = std::move(edits);
+  return info;
 }
 
-const Dictionary* HeardWord::allowed(const Dictionary* payload, std::optional<Dictionary>& changed) const {
-  if (!payload || !_word->fields) return payload;
-  config::EditedFields changes;
-  return _word->fields->apply(changed.emplace(*payload), changes) ? &*changed : payload;
+config::EditedFields HeardWord::restrict(std::optional<Dictionary>& payload) const {
+  config::EditedFields edits;
+  if (payload && _word->fields) _word->fields->apply(*payload, edits);
+  return edits;
 }
 
-void HeardWord::restrict(Array& logData) const {
-  if (!_word->fields) return;
-  config::EditedFields changes;
-  for (Value& element : logData) _word->fields->apply(element, changes);
+config::EditedFields HeardWord::restrict(Array& logData) const {
+  config::EditedFields edits;
+  if (!_word->fields) return edits;
+  for (Value& element : logData) _word->fields->apply(element, edits);
+  return edits;
 }
 
 }  // namespace veltrad::session

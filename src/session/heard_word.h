@@ -19,11 +19,12 @@ class HeardWord {
   // True if there is another word than before, which is heard now.
   bool hear();
   const config::OwnersWord& now() const { return *_word; }
-  // Without what the owner keeps back. Null stays null, and what holds nothing of that kind the same object.
-  backends::SharedDictionary allowed(const backends::SharedDictionary& userInfo) const;
-  // The payload itself, or, if it holds something that the owner keeps back, one without that in `changed`.
-  const Dictionary* allowed(const Dictionary* payload, std::optional<Dictionary>& changed) const;
-  void restrict(Array& logData) const;
+  // With what of it may leave: null stays null, and what holds nothing that the owner keeps back the same
+  // object.
+  backends::UserInfo allowed(backends::SharedDictionary userInfo) const;
+  // Take out what the owner keeps back, and say what that was.
+  config::EditedFields restrict(std::optional<Dictionary>& payload) const;
+  config::EditedFields restrict(Array& logData) const;
 
  private:
   const config::OwnerGate& _gate;

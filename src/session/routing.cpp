@@ -17,8 +17,8 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, Message m
     const auto& [name, backend] = *next++;
     // The last one owns the payload alone, so that it need not copy what it changes.
     auto payload = next == backends.end() ? std::move(message.payload) : message.payload;
-    auto [decision, answer] =
-        backend->sendMessage(std::move(payload), message.time, message.category, message.type, message.flag);
+    auto [decision, answer] = backend->sendMessage(std::move(payload), message.time, message.category,
+                                                   message.type, message.flag, message.note);
     if (outcomes) outcomes->push_back({name, decision});
     if (!answer) continue;
     messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);

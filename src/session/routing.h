@@ -20,6 +20,7 @@ struct Message {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   std::int32_t flag = 0;
+  backends::MessageNote note = {};
 };
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.

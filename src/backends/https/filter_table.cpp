@@ -35,7 +35,7 @@ FilterAction actionOn(const config::Filters& filters, const std::string& key, st
 }
 }  // namespace
 
-FilterTable::Outcome FilterTable::filterEvent(Dictionary& event) const {
+FilterTable::Outcome FilterTable::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
   Outcome outcome;
   if (!_filters || _filters->ofKey.empty()) return outcome;
   const std::int32_t method = event.int32("_method").value_or(0);
@@ -55,6 +55,7 @@ FilterTable::Outcome FilterTable::filterEvent(Dictionary& event) const {
     } else {
       ++outcome.removed;
     }
+    changes.changed(digest ? config::FieldChange::hashed : config::FieldChange::removed, key);
   }
   if (outcome.hashed + outcome.removed > 0) event = Dictionary::fromEntries(std::move(kept));
   return outcome;

@@ -99,7 +99,8 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   Dictionary event =
       createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
-  filterEvent(event);
+  config::EditedFields edits;
+  filterEvent(event, edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -162,8 +163,8 @@ void HTTPSPostBackend::addStopFields(Dictionary& payload, bool batching) const {
   payload.merge(fields);
 }
 
-void HTTPSPostBackend::filterEvent(Dictionary& event) const {
-  const FilterTable::Outcome outcome = _clientState.filters().filterEvent(event);
+void HTTPSPostBackend::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
+  const FilterTable::Outcome outcome = _clientState.filters().filterEvent(event, changes);
   if (outcome.removed > 0) _counters.count(wire::Reason::field_removed, outcome.removed);
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
@@ -225,7 +226,8 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   const std::size_t count = taken.events.size();
   if (const SharedDictionary& sent = facts->sentUserInfo) {
     Dictionary filtered = *sent;
-    filterEvent(filtered);
+    config::EditedFields edits;
+    filterEvent(filtered, edits);
     const std::size_t more = count * sizeOfEvent(filtered).charged;
     if (facts->account && !facts->account->keepMore(taken.charge, more)) {
       _posts.refusePost(*this, count, completion);

@@ -49,7 +49,8 @@ class HTTPSPostBackend final : public VeltraBackend {
                    std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
-  void filterEvent(Dictionary& event) const;
+  // Counts the changes; `changes` hears the names.
+  void filterEvent(Dictionary& event, config::FieldChanges& changes) const;
   Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
   wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
