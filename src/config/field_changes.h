@@ -26,6 +26,10 @@ struct EditedFields final : FieldChanges {
   void changed(FieldChange change, std::string_view name) override {
     (change == FieldChange::removed ? removed : hashed).emplace(name);
   }
+  void add(const EditedFields& others) {
+    removed.insert(others.removed.begin(), others.removed.end());
+    hashed.insert(others.hashed.begin(), others.hashed.end());
+  }
   bool empty() const { return removed.empty() && hashed.empty(); }
 };
 // Null: no field was changed.

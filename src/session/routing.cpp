@@ -70,10 +70,10 @@ bool uploadFile(const BackendSet* backends, const std::string& path, const std::
   return uploaded;
 }
 
-bool uploadLogDataArray(const BackendSet* backends, const Array& logData) {
+bool uploadLogDataArray(const BackendSet* backends, const Array& logData, const backends::MessageNote& note) {
   bool uploaded = false;
   if (backends) {
-    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadLogData(logData);
+    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadLogData(logData, note);
   }
   if (uploaded) {
     logDebug("uploadLogData: Log data array upload successful");

@@ -35,6 +35,6 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
 // These return whether a back end uploaded the data. `backends` may be null.
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
                 support::MessageLog& messageLog);
-bool uploadLogDataArray(const BackendSet* backends, const Array& logData);
+bool uploadLogDataArray(const BackendSet* backends, const Array& logData, const backends::MessageNote& note);
 
 }  // namespace veltrad::session

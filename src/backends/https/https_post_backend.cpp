@@ -6,6 +6,7 @@
 
 #include "backends/https/event.h"
 #include "backends/https/event_posts.h"
+#include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
@@ -49,6 +50,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
       _locale(making.locale),
       _counters(making.counters),
       _posts(making.posts),
+      _gate(making.gate),
       _clientState(*this, profile, making.locale, making.counters, making.identity),
       _held(std::make_shared<HeldEvents>(making.counters)) {
   setDisplayURL(profile->displayURL);
@@ -67,7 +69,9 @@ std::vector<std::string> HTTPSPostBackend::hosts() const {
 }
 
 void HTTPSPostBackend::dropWaiting() {
-  _counters.count(wire::Reason::refused_by_owner, _held->discard());
+  const std::size_t dropped = _held->discard();
+  _counters.count(wire::Reason::refused_by_owner, dropped);
+  if (_gate) _gate->receipt().add(http::Departure::Kind::post, facts()->client, dropped);
 }
 
 BackendActivity HTTPSPostBackend::activity() const {
@@ -101,6 +105,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   config::EditedFields edits;
   filterEvent(event, edits);
+  addOwnersEdits(*facts, message.note, edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -111,13 +116,28 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   const bool userInfoMissing = facts->requireUserInfo && !facts->userInfo;
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batching) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batching, facts->requireUserInfo);
-    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges);
+    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges, edits);
   }
-  return postEvent(std::move(event), *facts, message);
+  return postEvent(std::move(event), *facts, message, edits);
 }
 
-Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
-                                 const NumberedMessage& message) {
+bool HTTPSPostBackend::recorded() const {
+  return _gate != nullptr && _gate->keepsRecords();
+}
+
+void HTTPSPostBackend::addOwnersEdits(const SessionFacts& facts, const MessageNote& note,
+                                      config::EditedFields& edits) const {
+  if (!recorded()) return;
+  if (note.edits) edits.add(*note.edits);
+  if (facts.userInfoEdits) edits.add(*facts.userInfoEdits);
+}
+
+Dictionary HTTPSPostBackend::about(const SessionFacts& facts, const config::EditedFields& edits) const {
+  return recorded() ? aboutDeparture(name(), facts, _clientState.entry(), edits) : Dictionary();
+}
+
+Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message,
+                                 const config::EditedFields& edits) {
   const bool realtime = meansRealtime(message.flag);
   std::optional<std::string> flushed;
   if (realtime && !_held->empty()) {
@@ -148,7 +168,7 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
                              {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr});
+                              std::move(*charge), 0, nullptr, about(facts, edits)});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -170,7 +190,7 @@ void HTTPSPostBackend::filterEvent(Dictionary& event, config::FieldChanges& chan
 }
 
 Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
-                                  std::uint64_t sessionIDChanges) {
+                                  std::uint64_t sessionIDChanges, const config::EditedFields& edits) {
   // User info and filters may have changed the event's method.
   const std::int32_t method = event.int32("_method").value_or(0);
   // Removes these fields now, so that they take no memory until the flush.
@@ -187,6 +207,10 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* acc
     _held->restartCount(method);
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
+  }
+  if (recorded()) {
+    if (_held->empty()) _batchEdits = {};
+    _batchEdits.add(edits);
   }
   const wire::Reason kept = keep(std::move(event), size, method, account, sessionIDChanges);
   _counters.count(kept);
@@ -224,10 +248,11 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
+  config::EditedFields edits = std::exchange(_batchEdits, {});
   if (const SharedDictionary& sent = facts->sentUserInfo) {
     Dictionary filtered = *sent;
-    config::EditedFields edits;
     filterEvent(filtered, edits);
+    addOwnersEdits(*facts, {}, edits);
     const std::size_t more = count * sizeOfEvent(filtered).charged;
     if (facts->account && !facts->account->keepMore(taken.charge, more)) {
       _posts.refusePost(*this, count, completion);
@@ -254,7 +279,7 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
                          {std::move(posted.compact), std::nullopt, count, std::move(taken.charge),
-                          completionBytes, std::move(whenPosted)});
+                          completionBytes, std::move(whenPosted), about(*facts, edits)});
   return pretty;
 }
 
@@ -265,6 +290,11 @@ JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, cons
   const std::string& client = identity.clientIdentifier(facts.device);
   return _posts.createMessageForPostAndLogging(std::move(events), client, identity.loggingAllowed(),
                                                kEnvelope + client.size() + eventBytes);
+}
+
+void HTTPSPostBackend::takeIdentity(const std::string& udid) {
+  VeltraBackend::takeIdentity(udid);
+  _clientState.renewIdentifiers();
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {

@@ -13,6 +13,10 @@
 #include "backends/https/https_post_state.h"
 #include "backends/https/json_message.h"
 
+namespace veltrad::config {
+class OwnerGate;
+}  // namespace veltrad::config
+
 namespace veltrad::backends {
 
 class EventPosts;
@@ -24,6 +28,8 @@ struct HTTPSPostMaking {
   platform::Counters& counters;
   EventPosts& posts;
   PostIdentity::Sources identity;
+  // Null: the owner sets no limits.
+  config::OwnerGate* gate = nullptr;
 };
 
 class HTTPSPostBackend final : public VeltraBackend {
@@ -38,6 +44,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   Sent sendNumberedMessage(NumberedMessage&& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
+  void takeIdentity(const std::string& udid) override;
+  void rereadConsent() override { _clientState.rereadConsent(); }
   BackendActivity activity() const override;
   std::vector<std::string> hosts() const override;
   bool hostsAreFixed() const override { return false; }
@@ -51,10 +59,16 @@ class HTTPSPostBackend final : public VeltraBackend {
   void addStopFields(Dictionary& payload, bool batching) const;
   // Counts the changes; `changes` hears the names.
   void filterEvent(Dictionary& event, config::FieldChanges& changes) const;
-  Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
+  // For the history of what left, if one is kept: names of fields that the owner keeps back, too.
+  bool recorded() const;
+  void addOwnersEdits(const SessionFacts& facts, const MessageNote& note, config::EditedFields& edits) const;
+  Dictionary about(const SessionFacts& facts, const config::EditedFields& edits) const;
+  Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges,
+                  const config::EditedFields& edits);
   wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
-  Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message);
+  Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message,
+                 const config::EditedFields& edits);
   // `eventBytes` is an upper bound on the events' JSON texts.
   JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
                             std::size_t eventBytes) const;
@@ -62,11 +76,14 @@ class HTTPSPostBackend final : public VeltraBackend {
   platform::Locale& _locale;
   platform::Counters& _counters;
   EventPosts& _posts;
+  config::OwnerGate* const _gate;
 
   // The session's thread only.
   HTTPSPostState _clientState;
   // The batch is registered with the user's account.
   bool _evictable = false;
+  // Of the events in the batch, and perhaps of some that were dropped from it.
+  config::EditedFields _batchEdits;
 
   const std::shared_ptr<HeldEvents> _held;
 };
