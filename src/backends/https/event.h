@@ -40,8 +40,7 @@ struct WrittenEvent {
   bool settled = true;
 };
 
-// The message's payload with these fields: "_startTS" (the session's start, cut to
-// the minute),
+// The message's payload with these fields: "_startTS" (the session's start, cut to the minute),
 // "_sender", "_clientVersion", "_sessionID", "_eventNumber", "_method", "_status", "_clientTS" and
 // "eventTime" (exact offset from the cut start), "_productFamily", "_productModel", "_osVersion", "_build",
 // "_internal", "_reportVers", "_timezoneOffset" (seconds from GMT). A field whose text is absent is left out.

@@ -26,7 +26,7 @@ bool meansSamplingOverride(std::int32_t flag) {
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     const HTTPSPostMaking& making, const std::string& name,
-    std::shared_ptr<const config::HTTPSPostProfile> profile,
+    const std::shared_ptr<const config::HTTPSPostProfile>& profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
   if (!profile->clients) {
@@ -34,8 +34,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     making.counters.count(wire::Reason::no_clients);
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(
-      new HTTPSPostBackend(making, name, std::move(profile), *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, profile, *productFamily));
   if (!made->_clientState.identity().known()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -44,7 +43,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
+                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
                                    const std::string& productFamily)
     : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
