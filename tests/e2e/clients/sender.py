@@ -9,31 +9,22 @@ import time
 sys.path.insert(0, str(pathlib.Path(__file__).resolve().parents[3] / "python"))
 import veltra  # noqa: E402
 
-BURST = 16
-
-
-def main(name, microseconds, kind):
-    answers = []
-    session = veltra.Session(client_type=7, client_name=name, service_name="ringer", require_user_info=True,
-                             batch_events=True, connect_later=True)
-    session.start()
-    counts, number, longest = {True: 0, False: 0}, 0, 0.0
-    while number % BURST or not select.select([sys.stdin], [], [], 0)[0]:
-        begin = time.monotonic()
-        taken = session.send(5, 1, {"sender": name, "number": counts[True]},
-                             answered=answers.append if kind == "reply" else None)
-        longest = max(longest, time.monotonic() - begin)
-        counts[taken] += 1
-        number += 1
-        if number == BURST:
-            print("sending", flush=True)
-        if number % BURST == 0:
-            answers.clear()
-            time.sleep(BURST * microseconds / 1e6)
-    figures = session.statistics()
-    closed = session.close()
-    print(json.dumps({"sender": name, "sent": counts[True], "refused": counts[False], "lost": figures.lost,
-                      "closed": closed, "connections": figures.connections, "longest": longest * 1e6}))
-
-
-main(sys.argv[1], int(sys.argv[2]), sys.argv[3])
+name, microseconds, kind = sys.argv[1:]
+answered = (lambda answer: None) if kind == "reply" else None
+session = veltra.Session(client_type=7, client_name=name, service_name="ringer", require_user_info=True,
+                         batch_events=True, connect_later=True)
+session.start()
+sent = number = 0
+longest = 0.0
+while number % 16 or not select.select([sys.stdin], [], [], 0)[0]:
+    begin = time.monotonic()
+    sent += session.send(5, 1, {"sender": name, "number": sent}, answered=answered)
+    longest = max(longest, time.monotonic() - begin)
+    number += 1
+    if number == 16:
+        print("sending", flush=True)
+    if number % 16 == 0:
+        time.sleep(16e-6 * int(microseconds))
+figures = session.statistics()
+print(json.dumps({"sender": name, "sent": sent, "refused": number - sent, "lost": figures.lost, "closed": session.close(),
+                  "connections": figures.connections, "longest": longest * 1e6}))
