@@ -25,7 +25,7 @@ from veltra._wire import Error, Frame, FrameReader, call_body, encoded, frame
 _SECONDS_TO_CLOSE = 2.0
 _FIRST_PAUSE, _LONGEST_PAUSE = 0.2, 30.0  # between attempts to connect, at most; each is drawn from the upper half
 _READ_BYTES = 1 << 16  # at once
-_MOST_AT_ONCE = 64  # frames that are written before anything else is looked at
+_MOST_WRITES = 4  # before anything else is looked at
 _LONGEST_PATH = 107
 _ENDED = "The connection to the daemon ended before the answer came."
 
@@ -225,7 +225,7 @@ class Connection:
         found = self._poll(select.POLLIN | (select.POLLOUT if writes else 0), min(times, default=None))
         if found & ~select.POLLOUT:
             self._read()
-        for _ in range(_MOST_AT_ONCE if found & select.POLLOUT else 0):
+        for _ in range(_MOST_WRITES if found & select.POLLOUT else 0):
             with self._lock:
                 if self._socket is None or not self._out.write(self._socket):
                     break

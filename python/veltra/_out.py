@@ -11,6 +11,8 @@ from typing import Any, NamedTuple
 from veltra._record import Standing
 from veltra._wire import CALL, MOST_BODY, frame
 
+_BYTES_AT_ONCE = 1 << 14
+
 
 class Call:
     """A call whose answer somebody wants."""
@@ -45,8 +47,9 @@ class OutFrames:
         self._bytes = 0
         self._first = b""  # what comes before the calls
         self._released = self._held = False
-        self._part: bytes | None = None  # what is left of the first call, if its writing has begun
-        self._part_id, self._part_taken = 0, False
+        self._begun: deque[tuple[int, int]] = deque()  # ID and size of the frames of the first calls, which are written at once
+        self._rest = b""  # what is left of them
+        self._taken = 0  # the bytes that were taken of the first one
 
     def __len__(self) -> int:
         return len(self._calls)
@@ -60,12 +63,11 @@ class OutFrames:
         return True
 
     def withdraw(self, out: Out) -> bool:
-        """False: it does not wait, or a part of it was written."""
-        if out not in self._calls or (self._part_taken and self._calls[0] is out):
+        """False: it does not wait, or its writing has begun."""
+        if out not in self._calls or self._begun:
             return False
         self._calls.remove(out)
         self._bytes -= len(out.body)
-        self._part = None
         return True
 
     def connect(self, first: bytes) -> None:
@@ -81,8 +83,9 @@ class OutFrames:
 
     def disconnect(self) -> Out | None:
         """The connection has ended. Returns the call of which only a part was written."""
-        cut = self._take() if self._part_taken else None
-        self._first, self._part, self._part_taken = b"", None, False
+        cut = self._pop() if self._taken else None
+        self._begun.clear()
+        self._first, self._rest, self._taken = b"", b"", 0
         return cut
 
     def stop(self) -> list[Out]:
@@ -97,30 +100,42 @@ class OutFrames:
         return not self._held and bool(self._first or (self._released and self._calls))
 
     def write(self, end: socket.socket) -> bool:
-        """Writes what it can of the next frame. False: nothing more for now."""
+        """Writes as much as goes at once. False: nothing more for now."""
         if not self.writes():
             return False
-        if not self._first and self._part is None:
-            self._part_id = self._call_id(self._calls[0])
-            self._part = frame(CALL, self._part_id, self._calls[0].body)
-        data = self._first or self._part or b""
+        if not self._first and not self._rest:
+            self._begin()
+        data = self._first or self._rest
         try:
-            rest = data[end.send(data) :]
+            taken = end.send(data)
         except BlockingIOError:
             return False
         except OSError:
             self._held = True  # the reader will find the end, and what the daemon has said before it
             return False
         if self._first:
-            self._first = rest
+            self._first = data[taken:]
             return True
-        self._part, self._part_taken = rest, True
-        if not rest:
-            self._part, self._part_taken = None, False
-            self._wrote(self._take(), self._part_id)
+        self._rest = data[taken:]
+        self._taken += taken
+        while self._begun and self._taken >= self._begun[0][1]:
+            call, size = self._begun.popleft()
+            self._taken -= size
+            self._wrote(self._pop(), call)
         return True
 
-    def _take(self) -> Out:
+    def _begin(self) -> None:
+        frames, size = [], 0
+        for out in self._calls:
+            call = self._call_id(out)
+            frames.append(frame(CALL, call, out.body))
+            self._begun.append((call, len(frames[-1])))
+            size += len(frames[-1])
+            if size > _BYTES_AT_ONCE:
+                break
+        self._rest = b"".join(frames)
+
+    def _pop(self) -> Out:
         out = self._calls.popleft()
         self._bytes -= len(out.body)
         return out

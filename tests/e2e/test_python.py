@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""The Python client, against a daemon that works, is missing, comes later, restarts, stands still or refuses."""
+"""The Python client, against a daemon that works, is missing, comes later, restarts, refuses or stands still."""
 import itertools
 import os
 import signal
@@ -110,8 +110,3 @@ class Python(SystemTest):
         self.assertEqual(session.statistics().sent + lost, taken)
         self.assertEqual(said[-1][0], "closed")
         daemon.kill()
-
-    def test_a_refusal(self):
-        self.root.grant([])
-        with self.serving("entitlement"), self.assertRaisesRegex(veltra.Error, "entitle"):
-            self.session()
