@@ -12,7 +12,7 @@ import veltra  # noqa: E402
 name, microseconds, kind = sys.argv[1:]
 answered = (lambda answer: None) if kind == "reply" else None
 session = veltra.Session(client_type=7, client_name=name, service_name="ringer", require_user_info=True,
-                         batch_events=True, connect_later=True)
+                         batch_events=True, connect_later=True, queue_bytes=1 << 17)
 session.start()
 sent = number = 0
 longest = 0.0
