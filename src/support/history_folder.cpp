@@ -103,10 +103,8 @@ std::string HistoryFolder::nameOf(std::int64_t day) {
 std::optional<std::int64_t> HistoryFolder::dayNamed(std::string_view name) {
   std::tm parts{};
   const std::string text(name);
-  if (std::sscanf(text.c_str(), "%4d-%2d-%2d", &parts.tm_year, &parts.tm_mon, &parts.tm_mday) != 3)
-    return std::nullopt;
-  parts.tm_year -= 1900;
-  parts.tm_mon -= 1;
+  const char* end = ::strptime(text.c_str(), "%Y-%m-%d", &parts);
+  if (end == nullptr || *end != '\0') return std::nullopt;
   const std::int64_t day = ::timegm(&parts) / kSecondsOfDay;
   return nameOf(day) == name ? std::optional(day) : std::nullopt;
 }

@@ -64,7 +64,7 @@ std::string formatIdentifiers(const Dictionary& answer) {
     const Dictionary* identifier = one.asDictionary();
     if (!identifier) continue;
     const auto made = identifier->real("made");
-    out += fmt::format("\n  {}  {}{}{}", text(*identifier, "name"), text(*identifier, "value"),
+    out += fmt::format("\n  {:<16} {}{}{}", text(*identifier, "name"), text(*identifier, "value"),
                        made && std::isfinite(*made) ? "  made " + timeText(*made) : "",
                        identifier->boolean("resettable").value_or(true) ? "" : "  given in device.plist");
   }
@@ -106,12 +106,13 @@ std::string formatReceipt(const Dictionary& answer) {
                                          : name + "/" + service,
                        number(*client, "sessionID"), amounts(*client, {"events", "datagrams", "files"}));
   }
+  const std::string begun = amounts(dictionary(answer, "underWay"), {"posts", "events", "files"});
   const Dictionary& disk = dictionary(answer, "onDisk");
   return out + fmt::format(
-                   "\nunder way  {}, which is ended within a second\n"
+                   "\nunder way  {}\n"
                    "on disk    message log {}, energy log {}, history {} bytes",
-                   orNothing(amounts(dictionary(answer, "underWay"), {"posts", "events", "files"})),
-                   number(disk, "messageLog"), number(disk, "energyLog"), number(disk, "history"));
+                   begun.empty() ? "nothing" : begun + ": ended within a second", number(disk, "messageLog"),
+                   number(disk, "energyLog"), number(disk, "history"));
 }
 
 std::string wordsOf(Command command, const Dictionary& answer) {
