@@ -34,6 +34,7 @@ struct WrittenEvent {
   // "_method", which user info and filters may have changed; 0 if it is missing or no number.
   std::int32_t method = 0;
   FilterTable::Outcome filtered;
+  config::EditedFields edits;
   // Fields that were removed because JSON cannot represent them.
   std::size_t notJSON = 0;
   // The same user info, filtered by itself and merged again, would change nothing.

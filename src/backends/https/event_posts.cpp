@@ -66,6 +66,8 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
   http::HTTPRequest request =
       makePostRequest(facts, *url, post.text, post.eventMap, {_gzip, compressionLevel()});
   request.events = post.eventCount;
+  request.client = facts.client;
+  request.about = std::move(post.about);
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {

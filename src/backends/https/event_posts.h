@@ -35,6 +35,8 @@ class EventPosts {
     platform::Charge charge;
     std::size_t completionBytes = 0;
     VeltraBackend::FlushCompletion completion;
+    // As in http::Departure.
+    Dictionary about = {};
   };
 
   // Removes and counts fields that JSON cannot represent.

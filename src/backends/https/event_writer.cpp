@@ -53,9 +53,11 @@ void EventWriter::put(const Dictionary::Entry& field) {
   const auto digest = action == config::FilterAction::sha256 ? FilterTable::digestOf(value) : std::nullopt;
   if (!digest) {
     ++_event.filtered.removed;
+    _event.edits.changed(config::FieldChange::removed, key);
     return;
   }
   ++_event.filtered.hashed;
+  _event.edits.changed(config::FieldChange::hashed, key);
   ++_event.text.fields;
   _writer.Key(key);
   _writer.String(*digest);

@@ -30,7 +30,7 @@ FilterAction FilterTable::actionOn(std::string_view key, std::int32_t method, st
   return FilterAction::keep;
 }
 
-FilterTable::Outcome FilterTable::filterEvent(Dictionary& event) const {
+FilterTable::Outcome FilterTable::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
   Outcome outcome;
   if (empty()) return outcome;
   const std::int32_t method = event.int32("_method").value_or(0);
@@ -50,6 +50,7 @@ FilterTable::Outcome FilterTable::filterEvent(Dictionary& event) const {
     } else {
       ++outcome.removed;
     }
+    changes.changed(digest ? config::FieldChange::hashed : config::FieldChange::removed, key);
   }
   if (outcome.hashed + outcome.removed > 0) event = Dictionary::fromEntries(std::move(kept));
   return outcome;

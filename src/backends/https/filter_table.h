@@ -10,6 +10,7 @@
 
 #include "base/value.h"
 #include "config/client_entry.h"
+#include "config/field_changes.h"
 
 namespace veltrad::backends {
 
@@ -24,8 +25,8 @@ class FilterTable {
     std::size_t removed = 0;
     std::size_t hashed = 0;
   };
-  // Filters the event in place by its own "_method" and "_status" (0 if missing).
-  Outcome filterEvent(Dictionary& event) const;
+  // Filters the event in place by its own "_method" and "_status" (0 if missing). `changes` hears the names.
+  Outcome filterEvent(Dictionary& event, config::FieldChanges& changes) const;
   // True if every field is kept.
   bool empty() const { return !_filters || _filters->ofKey.empty(); }
   // What happens to a field of an event with this method and status. Not empty().

@@ -7,6 +7,7 @@
 
 #include "backends/https/event_posts.h"
 #include "backends/https/json_fields.h"
+#include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
@@ -49,6 +50,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
       _locale(making.locale),
       _counters(making.counters),
       _posts(making.posts),
+      _gate(making.gate),
       _clientState(*this, profile, making.locale, making.counters, making.identity),
       _held(std::make_shared<HeldEvents>(making.counters)) {
   setDisplayURL(profile->displayURL);
@@ -67,7 +69,9 @@ std::vector<std::string> HTTPSPostBackend::hosts() const {
 }
 
 void HTTPSPostBackend::dropWaiting() {
-  _counters.count(wire::Reason::refused_by_owner, _held->discard());
+  const std::size_t dropped = _held->discard();
+  _counters.count(wire::Reason::refused_by_owner, dropped);
+  if (_gate) _gate->receipt().add(http::Departure::Kind::post, facts()->client, dropped);
 }
 
 BackendActivity HTTPSPostBackend::activity() const {
@@ -97,6 +101,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
     }
   }
   WrittenEvent event = writeEvent(*facts, message);
+  addOwnersEdits(*facts, message.note, event.edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -109,7 +114,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batching, facts->requireUserInfo);
     return batchEvent(std::move(event), facts->account.get(), sessionIDChanges);
   }
-  return postEvent(std::move(event.text), *facts, message);
+  return postEvent(std::move(event), *facts, message);
 }
 
 WrittenEvent HTTPSPostBackend::writeEvent(const SessionFacts& facts, const NumberedMessage& message) {
@@ -131,7 +136,23 @@ void HTTPSPostBackend::noteUserInfo(const SessionFacts& facts) {
   _writtenFilters = _clientState.filters();
 }
 
-Sent HTTPSPostBackend::postEvent(EventText event, const SessionFacts& facts, const NumberedMessage& message) {
+bool HTTPSPostBackend::recorded() const {
+  return _gate != nullptr && _gate->keepsRecords();
+}
+
+void HTTPSPostBackend::addOwnersEdits(const SessionFacts& facts, const MessageNote& note,
+                                      config::EditedFields& edits) const {
+  if (!recorded()) return;
+  if (note.edits) edits.add(*note.edits);
+  if (facts.userInfoEdits) edits.add(*facts.userInfoEdits);
+}
+
+Dictionary HTTPSPostBackend::about(const SessionFacts& facts, const config::EditedFields& edits) const {
+  return recorded() ? aboutDeparture(name(), facts, _clientState.entry(), edits) : Dictionary();
+}
+
+Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
+                                 const NumberedMessage& message) {
   const bool realtime = meansRealtime(message.flag);
   std::optional<std::string> flushed;
   if (realtime && !_held->empty()) {
@@ -144,13 +165,13 @@ Sent HTTPSPostBackend::postEvent(EventText event, const SessionFacts& facts, con
   logDebug("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), _clientState.batchEvents(facts),
            facts.requireUserInfo);
   std::optional<platform::Charge> charge{std::in_place};
-  const EventSize size = sizeOfEvent(event);
+  const EventSize size = sizeOfEvent(event.text);
   if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
   if (!charge) {
     return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
   }
   std::vector<std::string> events;
-  events.push_back(std::move(event.json));
+  events.push_back(std::move(event.text.json));
   JSONMessage posted = createMessage(std::move(events), facts);
   std::optional<std::string> result = std::move(posted.pretty);
   if (flushed) {
@@ -161,7 +182,7 @@ Sent HTTPSPostBackend::postEvent(EventText event, const SessionFacts& facts, con
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
                              {std::move(posted.text), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr});
+                              std::move(*charge), 0, nullptr, about(facts, event.edits)});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -196,6 +217,10 @@ Sent HTTPSPostBackend::batchEvent(WrittenEvent event, platform::MemoryAccount* a
     _held->restartCount(method);
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
+  }
+  if (recorded()) {
+    if (_held->empty()) _batchEdits = {};
+    _batchEdits.add(event.edits);
   }
   const wire::Reason kept =
       keep(method, {std::move(event.text), size, account ? account->nextTurn() : 0, event.settled}, account,
@@ -235,7 +260,8 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   noteUserInfo(*facts);
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
-  if (facts->sentUserInfo && !mergeUserInfo(taken, *facts)) {
+  config::EditedFields edits = std::exchange(_batchEdits, {});
+  if (facts->sentUserInfo && !mergeUserInfo(taken, *facts, edits)) {
     _posts.refusePost(*this, count, completion);
     return std::nullopt;
   }
@@ -255,13 +281,15 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
                          {std::move(posted.text), std::nullopt, count, std::move(taken.charge),
-                          completionBytes, std::move(whenPosted)});
+                          completionBytes, std::move(whenPosted), about(*facts, edits)});
   return pretty;
 }
 
-bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts) {
+bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts,
+                                     config::EditedFields& edits) {
   Dictionary info = *facts.sentUserInfo;
-  count(_clientState.filters().filterEvent(info));
+  count(_clientState.filters().filterEvent(info, edits));
+  addOwnersEdits(facts, {}, edits);
   const auto unsettled = static_cast<std::size_t>(std::count_if(
       taken.events.begin(), taken.events.end(), [](const auto& event) { return !event.settled; }));
   if (unsettled == 0) return true;
@@ -284,6 +312,11 @@ JSONMessage HTTPSPostBackend::createMessage(std::vector<std::string> events,
   const PostIdentity& identity = _clientState.identity();
   return _posts.createMessageForPostAndLogging(std::move(events), identity.clientIdentifier(facts.device),
                                                identity.loggingAllowed());
+}
+
+void HTTPSPostBackend::takeIdentity(const std::string& udid) {
+  VeltraBackend::takeIdentity(udid);
+  _clientState.renewIdentifiers();
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {
