@@ -81,7 +81,7 @@ std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, Edite
     if (rule == Rule::keep) {
       auto inner = edited(value, changes);
       changed = changed || inner.has_value();
-      entries.emplace_back(name, inner ? std::move(*inner) : value);
+      entries.emplace_back(name, inner ? std::move(*inner) : Value(value));
       continue;
     }
     changed = true;

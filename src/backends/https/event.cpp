@@ -61,7 +61,7 @@ std::string senderCode(std::int32_t compType) {
 }
 
 Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::string& productFamily,
-                                      NumberedMessage&& message, int timeZoneOffset) {
+                                      NumberedMessage& message, int timeZoneOffset) {
   const DeviceFacts& device = facts.device;
   const std::int32_t startTS = coarsenedStart(facts.startTimeStamp);
   const double clientTS =

@@ -25,7 +25,7 @@ bool meansSamplingOverride(std::int32_t flag) {
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     const HTTPSPostMaking& making, const std::string& name,
-    std::shared_ptr<const config::HTTPSPostProfile> profile,
+    const std::shared_ptr<const config::HTTPSPostProfile>& profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
   if (!profile->clients) {
@@ -33,8 +33,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     making.counters.count(wire::Reason::no_clients);
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(
-      new HTTPSPostBackend(making, name, std::move(profile), *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, profile, *productFamily));
   if (!made->_clientState.identity().known()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -43,7 +42,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
+                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
                                    const std::string& productFamily)
     : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
@@ -96,8 +95,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
-  Dictionary event =
-      createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
+  Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
   filterEvent(event);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {

@@ -31,7 +31,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   // Null without a profile, a product family or, after an error line, the profile's "clients".
   static std::shared_ptr<HTTPSPostBackend> initWithName(
       const HTTPSPostMaking& making, const std::string& name,
-      std::shared_ptr<const config::HTTPSPostProfile> profile,
+      const std::shared_ptr<const config::HTTPSPostProfile>& profile,
       const std::optional<std::string>& productFamily);
 
   void updateState() override;
@@ -46,7 +46,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   void dropWaiting() override;
 
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                   std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
+                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+                   const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
   void filterEvent(Dictionary& event) const;

@@ -65,7 +65,7 @@ const std::string& PostIdentity::clientIdentifier(const DeviceFacts& device) con
 bool PostIdentity::loggingAllowed() const {
   if (_dnuType == 0 && _dnuEnabled) return true;
   if (!_forceEventLogging) return false;
-  const auto environment = _settings.currentEnvironment();
+  const std::uint32_t environment = _settings.currentEnvironment().value_or(0);
   return environment == 1 || environment == 2;
 }
 

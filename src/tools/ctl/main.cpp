@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
+#include <exception>
 
 #include "tools/ctl/config_command.h"
 #include "tools/ctl/doctor_command.h"
@@ -12,8 +13,10 @@
 #include "tools/ctl/stats_command.h"
 #include "tools/ctl/status_command.h"
 
-int main(int argc, char** argv) {
-  using namespace veltrad::ctl;
+namespace veltrad::ctl {
+namespace {
+
+int run(int argc, char** argv) {
   const auto parsed = parseOptions(argc, argv);
   if (const auto* ending = std::get_if<Ending>(&parsed)) {
     std::fputs(ending->output.c_str(), stdout);
@@ -44,5 +47,17 @@ int main(int argc, char** argv) {
       return runSession(options, interrupt);
     default:
       return runOneCall(options, interrupt);
+  }
+}
+
+}  // namespace
+}  // namespace veltrad::ctl
+
+int main(int argc, char** argv) {
+  try {
+    return veltrad::ctl::run(argc, argv);
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "veltractl: %s\n", error.what());
+    return 1;
   }
 }

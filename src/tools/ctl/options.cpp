@@ -20,7 +20,6 @@
 namespace veltrad::ctl {
 namespace {
 
-constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
     "metrics, doctor, config, refresh or report";

@@ -13,6 +13,9 @@
 
 namespace veltrad::ctl {
 
+// The exit status of a command line that cannot be used.
+inline constexpr int kWrongUsage = 2;
+
 // The content of the session info. Absent values are left out.
 struct Identity {
   std::optional<std::int32_t> clientType;
