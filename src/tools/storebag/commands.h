@@ -2,8 +2,12 @@
 // The commands of veltra-storebag.
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
+
+#include "storebag/given.h"
 
 namespace veltrad::storebag {
 
@@ -58,5 +62,27 @@ struct FormatRequest {
 Outcome format(const FormatRequest& request);
 // Prints the JSON Schema of storebags.
 Outcome schema();
+
+// What explain is given besides what `given` holds already. Its 13 fields are its options.
+struct ExplainRequest {
+  std::string file;
+  Given given;
+  std::vector<std::string> userInfo, draws, payload;
+  std::optional<std::string> device, policy, messages, payloadFile;
+  std::optional<std::uint16_t> category, type;
+  std::int32_t flag = 0;
+  bool json = false;
+};
+// Says what each back end does with the messages of such a session.
+Outcome explain(const ExplainRequest& request);
+
+struct TestRequest {
+  std::vector<std::string> suites;
+  // Where the results are written in the form of JUnit.
+  std::optional<std::string> junit;
+  bool json = false;
+};
+// Runs suites of cases.
+Outcome test(const TestRequest& request);
 
 }  // namespace veltrad::storebag

@@ -84,7 +84,7 @@ std::set<std::size_t> shadowsOf(const Clientele& entry, const std::vector<Client
   return shadows;
 }
 
-std::string listed(const std::set<std::size_t>& numbers) {
+std::string listedNumbers(const std::set<std::size_t>& numbers) {
   std::string text;
   for (const std::size_t number : numbers) text += fmt::format("{}[{}]", text.empty() ? "" : " and ", number);
   return text;
@@ -158,8 +158,8 @@ void EntryCheck::checkEntries(const Spot& at, const Array& entries) const {
     } else if (const auto shadows = shadowsOf(entry, above); !shadows.empty()) {
       _sink.say(shadowed_entry, at.element(i),
                 fmt::format("never used: everyone whom it fits has {} {} first",
-                            shadows.size() == 1 ? "entry" : "entries", listed(shadows)),
-                fmt::format("Put it above {}, or take it out.", listed({*shadows.begin()})));
+                            shadows.size() == 1 ? "entry" : "entries", listedNumbers(shadows)),
+                fmt::format("Put it above {}, or take it out.", listedNumbers({*shadows.begin()})));
     }
     above.push_back(entry);
   }

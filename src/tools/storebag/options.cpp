@@ -7,6 +7,7 @@
 #include "base/version.h"
 #include "storebag/findings.h"
 #include "storebag/spelling.h"
+#include "wire/constants.h"
 
 namespace veltrad::storebag {
 
@@ -90,16 +91,100 @@ void describeWriting(CLI::App& app, Arguments& given) {
   schema->callback([&given] { given.outcome = storebag::schema(); });
 }
 
+void addSession(CLI::App& command, Arguments& given) {
+  Given& session = given.explain.given;
+  command.add_option("--client-type", session.clientType, "Kind of client, which selects the storebag")
+      ->type_name("N")
+      ->check(CLI::Range(0, 17));
+  command
+      .add_option_function<std::string>(
+          "--environment",
+          [&session](const std::string& name) {
+            const auto environment = environmentNamed(name);
+            if (!environment) throw CLI::ValidationError("--environment", environment.error());
+            session.environment = environment.value();
+          },
+          "Environment of the device, as its section is named [release]")
+      ->type_name("NAME");
+  for (const auto& [option, key] : {std::pair("--client", wire::kVeltraUserInfoClientName),
+                                    std::pair("--service", wire::kVeltraUserInfoServiceName)})
+    command
+        .add_option_function<std::string>(
+            option, [&session, key = key](const std::string& name) { session.setUserInfo(key, name); },
+            std::string("User info \"") + key + "\"")
+        ->type_name("NAME");
+  command
+      .add_option("--user-info", given.explain.userInfo, "More user info; repeat the option for each entry")
+      ->type_name("KEY=VALUE")
+      ->allow_extra_args(false);
+  command.add_option("--session-id", session.sessionID, "The client's number for this session")
+      ->type_name("N");
+  command.add_option("--client-version", session.clientVersion, "The client's version")->type_name("N");
+  command.add_flag("--require-user-info", session.requireUserInfo, "Report nothing without user info");
+  command.add_flag("--batch-events", session.batchEvents, "Let back ends collect events");
+}
+
+void addDevice(CLI::App& command, Arguments& given) {
+  Given& session = given.explain.given;
+  command.add_option("--country", session.country, "Country of the locale; without it there is none")
+      ->type_name("CODE");
+  command
+      .add_option_function<std::string>(
+          "--consent", [&session](const std::string& word) { session.consent = word == "yes"; },
+          "Whether the user has consented: yes or no [yes]")
+      ->type_name("WORD")
+      ->check(CLI::IsMember({"yes", "no"}));
+  command
+      .add_option("--device", given.explain.device, "Properties of the device, with the keys of device.plist")
+      ->type_name("FILE");
+  command.add_option("--policy", given.explain.policy, "Limits of the owner, as in policy.json")
+      ->type_name("FILE");
+  command
+      .add_option("--draw", given.explain.draws,
+                  "Sampling factor of all back ends, or NAME=X of one; may be repeated [sampled in]")
+      ->type_name("X")
+      ->allow_extra_args(false);
+}
+
+void describePlaying(CLI::App& app, Arguments& given) {
+  CLI::App* explain = addCommand(app, "explain", "Show what a storebag does with messages of a session");
+  explain->add_option("FILE", given.explain.file, "A container or an unsigned storebag")->required();
+  addSession(*explain, given);
+  addDevice(*explain, given);
+  explain->add_option("--category", given.explain.category, "Category of the message")->type_name("N");
+  explain->add_option("--type", given.explain.type, "Type of the message")->type_name("N");
+  explain->add_option("--flag", given.explain.flag, "1: realtime, 2: overrides sampling, 3: both")
+      ->type_name("N")
+      ->check(CLI::Range(0, 3));
+  explain->add_option("ENTRY", given.explain.payload, "Entries of the message's payload: KEY=VALUE");
+  explain->add_option("--payload", given.explain.payloadFile, "The payload: one JSON object")
+      ->type_name("FILE");
+  explain
+      ->add_option("--messages", given.explain.messages,
+                   "Messages as veltractl watch --json --contents and veltractl session have them")
+      ->type_name("FILE");
+  explain->add_flag("--json", given.explain.json, "Print one object");
+  explain->callback([&given] { given.outcome = storebag::explain(given.explain); });
+
+  CLI::App* test = addCommand(app, "test", "Run suites of cases that say what a storebag is to do");
+  test->add_option("SUITE", given.test.suites, "Suites as JSON with comments")->required();
+  test->add_option("--junit", given.test.junit, "Also write the results there, for build servers")
+      ->type_name("FILE");
+  test->add_flag("--json", given.test.json, "Print one object");
+  test->callback([&given] { given.outcome = storebag::test(given.test); });
+}
+
 }  // namespace
 
 void describe(CLI::App& app, Arguments& given) {
   app.name("veltra-storebag");
-  app.description("Create signing keys; write, check, sign, verify and show storebags.");
+  app.description("Create signing keys; write, check, try, sign, verify and show storebags.");
   tools::useManualStyle(app);
   app.set_version_flag("--version", std::string("veltra-storebag ") + kVersion, "Print the version");
   app.require_subcommand(1);
   describeKeys(app, given);
   describeWriting(app, given);
+  describePlaying(app, given);
   app.footer(kFooter);  // last, because commands inherit it
 }
 

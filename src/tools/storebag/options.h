@@ -17,6 +17,8 @@ struct Arguments {
   SignRequest sign;
   LintRequest lint;
   FormatRequest format;
+  ExplainRequest explain;
+  TestRequest test;
   // Of the command, which runs while the arguments are parsed.
   Outcome outcome;
 };
