@@ -26,9 +26,10 @@ void VeltraBackend::updateState() {
 }
 
 Sent VeltraBackend::sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp,
-                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag) {
+                                std::uint16_t method, std::uint16_t respCode, std::int32_t flag,
+                                const MessageNote& note) {
   ++_eventID;
-  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag});
+  return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag, note});
 }
 
 Sent VeltraBackend::sendNumberedMessage(NumberedMessage&&) {
@@ -46,7 +47,7 @@ bool VeltraBackend::uploadFileAtPath(const std::string&, const std::string&) {
   return false;
 }
 
-bool VeltraBackend::uploadLogData(const Array&) {
+bool VeltraBackend::uploadLogData(const Array&, const MessageNote&) {
   return false;
 }
 
@@ -60,11 +61,11 @@ void VeltraBackend::setFacts(SharedFacts facts) {
   _facts.swap(facts);
 }
 
-void VeltraBackend::setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent) {
+void VeltraBackend::setUserInfoDict(const UserInfo& info) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
-  changed->userInfo = std::move(userInfo);
-  changed->sentUserInfo = std::move(sent);
+  changed->take(info);
+  changed->client = clientOf(*changed);
   _facts = std::move(changed);
 }
 
@@ -72,6 +73,13 @@ void VeltraBackend::setCorrelatedSessionID(const std::string& sessionID) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
   changed->combinedSessionIDString = sessionID;
+  _facts = std::move(changed);
+}
+
+void VeltraBackend::takeIdentity(const std::string& udid) {
+  const Lock held(_mutex);
+  auto changed = std::make_shared<SessionFacts>(*_facts);
+  changed->device.udid = udid;
   _facts = std::move(changed);
 }
 

@@ -54,13 +54,21 @@ struct Sent {
   std::optional<std::string> text;
 };
 
+// What is known of a message before any back end has it.
+struct MessageNote {
+  // What the owner keeps back of the payload; null: nothing. Valid during the call.
+  const config::EditedFields* edits = nullptr;
+};
+
 struct NumberedMessage {
+  // Without what the owner of the device keeps back.
   std::optional<Dictionary> payload;
   platform::TimeValue timestamp;
   std::uint16_t method = 0;
   std::uint16_t respCode = 0;
   std::uint16_t eventID = 0;
   std::int32_t flag = 0;
+  MessageNote note = {};
 };
 
 // One back end of one session. It outlives its session only while its own work is under way.
@@ -81,15 +89,21 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
   // Numbers the message (1, 2, … 65535, 0, …) and passes it on.
   Sent sendMessage(std::optional<Dictionary> payload, platform::TimeValue timestamp, std::uint16_t method,
-                   std::uint16_t respCode, std::int32_t flag);
+                   std::uint16_t respCode, std::int32_t flag, const MessageNote& note = {});
   // May take the payload out of the message, so that nothing in it needs to be copied. By default the back
   // end takes no messages.
   virtual Sent sendNumberedMessage(NumberedMessage&& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
-  virtual bool uploadLogData(const Array& logData);
+  virtual bool uploadLogData(const Array& logData, const MessageNote& note);
   virtual void setCorrelatedSessionID(const std::string& sessionID);
+  // The device has another identifier, and the back end makes others of its own.
+  virtual void takeIdentity(const std::string& udid);
+  // The owner has given or withdrawn consent where the policy asks for it on open sessions, too.
+  virtual void rereadConsent() {}
+  // Drops what waits and bears the device's identifier. Any thread.
+  virtual void dropIdentified() {}
 
   // Constant after construction.
   const std::string& name() const { return _name; }
@@ -101,8 +115,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Any thread. Never null; a change of the facts does not affect those that a caller already has.
   SharedFacts facts() const;
   void setFacts(SharedFacts facts);
-  // `sent`: what of it may leave the device.
-  void setUserInfoDict(SharedDictionary userInfo, SharedDictionary sent);
+  void setUserInfoDict(const UserInfo& info);
   std::int32_t state() const { return stateVerdict().state; }
   // Disabled while the owner of the device forbids it.
   StateVerdict stateVerdict() const {

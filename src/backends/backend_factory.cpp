@@ -64,7 +64,8 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
          _services.locale,
          _services.counters,
          _posts,
-         {_services.preferences, _services.library, _services.settings}},
+         {_services.preferences, _services.library, _services.settings},
+         _services.gate},
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {

@@ -9,6 +9,7 @@
 #include <string>
 
 #include "base/value.h"
+#include "config/field_changes.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::backends {
@@ -39,6 +40,13 @@ struct SelfVersion {
   std::uint8_t minor = 0;
 };
 
+// The user info as the client gave it, what of it may leave the device, and what differs. Each may be null.
+struct UserInfo {
+  SharedDictionary given;
+  SharedDictionary sent;
+  config::SharedEdits edits;
+};
+
 // The pointers may be null.
 struct SessionFacts {
   DeviceFacts device;
@@ -56,11 +64,30 @@ struct SessionFacts {
   SharedDictionary userInfo;
   // The same without what the owner of the device keeps back: this may leave.
   SharedDictionary sentUserInfo;
+  // What of the user info differs between the two.
+  config::SharedEdits userInfoEdits;
+  // Whose messages these are, for the owner of the device; made of the fields above.
+  SharedDictionary client;
+  // What the back ends were made from: {"name", "version", "section"}.
+  SharedDictionary storebag;
   std::optional<std::string> combinedSessionIDString;
   // Pays for what is kept.
   std::shared_ptr<platform::MemoryAccount> account;
+
+  void take(const UserInfo& info) {
+    userInfo = info.given;
+    sentUserInfo = info.sent;
+    userInfoEdits = info.edits;
+  }
 };
 using SharedFacts = std::shared_ptr<const SessionFacts>;
+
+// {"clientType", "sessionID", "client", "service"}; names that may not leave are not among them.
+SharedDictionary clientOf(const SessionFacts& facts);
+// What else the history of what left says of it: {"backend", "storebag", "entry", "removed", "hashed"}.
+// `entry`: the number of the client entry, counted from 0.
+Dictionary aboutDeparture(const std::string& backend, const SessionFacts& facts,
+                          std::optional<std::size_t> entry, const config::EditedFields& edits);
 
 // Client types 7, 11 and 13: they have an adaptor, and numeric session IDs on internal builds.
 constexpr bool isAdaptorClientType(std::int32_t clientType) {

@@ -25,7 +25,7 @@ std::unordered_set<std::string> lowered(const TextList& names) {
 
 }  // namespace
 
-FieldRules::FieldRules(const PolicyRules& rules, std::string secret)
+FieldRules::FieldRules(const PolicyRules& rules, std::optional<std::string> secret)
     : _remove(lowered(rules.remove)), _hash(lowered(rules.hash)), _secret(std::move(secret)) {}
 
 FieldRules::Rule FieldRules::ruleOf(std::string_view name) const {
@@ -39,6 +39,7 @@ bool FieldRules::removes(std::string_view name) const {
 }
 
 std::optional<std::string> FieldRules::digest(const Value& value) const {
+  if (!_secret) return std::nullopt;
   std::string text;
   switch (value.type()) {
     case Value::Type::string:
@@ -57,23 +58,23 @@ std::optional<std::string> FieldRules::digest(const Value& value) const {
   }
   unsigned char bytes[32];
   unsigned length = 0;
-  if (HMAC(EVP_sha256(), _secret.data(), static_cast<int>(_secret.size()),
+  if (HMAC(EVP_sha256(), _secret->data(), static_cast<int>(_secret->size()),
            reinterpret_cast<const unsigned char*>(text.data()), text.size(), bytes, &length) == nullptr)
     std::abort();
   return hex({reinterpret_cast<const char*>(bytes), length});
 }
 
-bool FieldRules::apply(Dictionary& message, EditedFields& changes) const {
+bool FieldRules::apply(Dictionary& message, FieldChanges& changes) const {
   auto changed = empty() ? std::nullopt : edited(message, changes);
   if (changed) message = std::move(*changed);
   return changed.has_value();
 }
 
-void FieldRules::apply(Value& value, EditedFields& changes) const {
+void FieldRules::apply(Value& value, FieldChanges& changes) const {
   if (auto changed = edited(value, changes)) value = std::move(*changed);
 }
 
-std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, EditedFields& changes) const {
+std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, FieldChanges& changes) const {
   std::vector<Dictionary::Entry> entries;
   bool changed = false;
   for (const auto& [name, value] : dictionary) {
@@ -86,17 +87,17 @@ std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, Edite
     }
     changed = true;
     if (auto text = rule == Rule::hash ? digest(value) : std::nullopt) {
-      changes.hashed.insert(name);
+      changes.changed(FieldChange::hashed, name);
       entries.emplace_back(name, Value(std::move(*text)));
     } else {
-      changes.removed.insert(name);
+      changes.changed(FieldChange::removed, name);
     }
   }
   if (!changed) return std::nullopt;
   return Dictionary::fromEntries(std::move(entries));
 }
 
-std::optional<Value> FieldRules::edited(const Value& value, EditedFields& changes) const {
+std::optional<Value> FieldRules::edited(const Value& value, FieldChanges& changes) const {
   if (const Dictionary* dictionary = value.asDictionary()) {
     auto inner = edited(*dictionary, changes);
     return inner ? std::optional<Value>(std::move(*inner)) : std::nullopt;

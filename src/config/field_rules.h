@@ -3,50 +3,46 @@
 #pragma once
 
 #include <optional>
-#include <set>
 #include <string>
 #include <string_view>
 #include <unordered_set>
 
 #include "base/value.h"
+#include "config/field_changes.h"
 #include "config/policy.h"
 
 namespace veltrad::config {
-
-// The names of the fields that were changed, as the messages have them.
-struct EditedFields {
-  std::set<std::string> removed;
-  std::set<std::string> hashed;
-};
 
 // Immutable. Fields are found at any depth of dictionaries and arrays by their names, letter case ignored; of
 // one that is to be removed and hashed nothing stays.
 class FieldRules {
  public:
-  // `secret`: of this device; the key of the digests.
-  FieldRules(const PolicyRules& rules, std::string secret);
+  // `secret`: of this device; the key of the digests. Without one, fields that are to be hashed are removed.
+  FieldRules(const PolicyRules& rules, std::optional<std::string> secret);
 
+  bool madeWith(const std::optional<std::string>& secret) const { return secret == _secret; }
   bool empty() const { return _remove.empty() && _hash.empty(); }
   // True if a field of this name is removed.
   bool removes(std::string_view name) const;
   // Changes the message in place; one without such fields stays the same shared object.
   // False if there were none.
-  bool apply(Dictionary& message, EditedFields& changes) const;
-  void apply(Value& value, EditedFields& changes) const;
+  bool apply(Dictionary& message, FieldChanges& changes) const;
+  void apply(Value& value, FieldChanges& changes) const;
   // The value that stands for one that is to be hashed: the HMAC-SHA-256 of a text, or of the JSON text of
-  // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed.
+  // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed, and
+  // everything while there is no secret.
   std::optional<std::string> digest(const Value& value) const;
 
  private:
   enum class Rule { keep, remove, hash };
   Rule ruleOf(std::string_view name) const;
   // Nothing: it holds no such field.
-  std::optional<Dictionary> edited(const Dictionary& dictionary, EditedFields& changes) const;
-  std::optional<Value> edited(const Value& value, EditedFields& changes) const;
+  std::optional<Dictionary> edited(const Dictionary& dictionary, FieldChanges& changes) const;
+  std::optional<Value> edited(const Value& value, FieldChanges& changes) const;
 
   std::unordered_set<std::string> _remove;
   std::unordered_set<std::string> _hash;
-  const std::string _secret;
+  const std::optional<std::string> _secret;
 };
 
 }  // namespace veltrad::config

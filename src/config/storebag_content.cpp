@@ -112,8 +112,9 @@ void take(const Key&, const Value& value, Reliable& field) {
   field = {true, value.toInt32().value_or(0)};
 }
 
-std::shared_ptr<const StorebagSection> parseSection(const Dictionary& section) {
+std::shared_ptr<const StorebagSection> parseSection(const Dictionary& section, StorebagOrigin origin) {
   auto made = std::make_shared<StorebagSection>();
+  made->origin = std::move(origin);
   made->asGiven = section;
   for (const auto& [name, value] : section) made->backends.emplace(name, nullptr);
   readKeys(StorebagSection::kKeys, section, made.get());

@@ -57,8 +57,16 @@ struct UploadProfile {
 
 using Profile = std::variant<HTTPSPostProfile, DashboardProfile, UploadProfile>;
 
+// Where a section is from, as those who look after the device know it.
+struct StorebagOrigin {
+  std::string name;                    // of the storebag
+  std::optional<std::string> version;  // which it need not have
+  std::string section;
+};
+
 // The back ends of one environment.
 struct StorebagSection {
+  StorebagOrigin origin;
   Dictionary asGiven;
   // All entries by name. Null if the back end is unknown or its entry is not read.
   std::map<std::string, std::shared_ptr<const Profile>> backends;
@@ -66,7 +74,7 @@ struct StorebagSection {
   static const KeyTable kKeys;
 };
 
-std::shared_ptr<const StorebagSection> parseSection(const Dictionary& section);
+std::shared_ptr<const StorebagSection> parseSection(const Dictionary& section, StorebagOrigin origin = {});
 
 struct Storebag {
   std::optional<Dictionary> development;

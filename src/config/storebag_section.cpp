@@ -21,11 +21,15 @@ constexpr std::uint32_t kReleaseEnvironment = 4;
 
 // Completes the answer with the section of the environment, if there is one. Returns the storebag for its
 // other keys.
-Storebag takeSection(const Dictionary& whole, std::uint32_t environment, StorebagSectionAnswer& answer) {
+Storebag takeSection(const char* name, const Dictionary& whole, std::uint32_t environment,
+                     StorebagSectionAnswer& answer) {
   auto storebag = parsed<Storebag>(whole);
   if (const Dictionary* section = sectionOf(storebag, environment)) {
+    const bool standsIn = environment == kSeedEnvironment && !storebag.seed;
     answer.kind = StorebagAnswer::Kind::fetched;
-    answer.section = parseSection(*section);
+    answer.section = parseSection(
+        *section,
+        {name, storebag.version, sectionNameForEnvironment(standsIn ? kReleaseEnvironment : environment)});
     answer.version = storebag.version;
   }
   return storebag;
@@ -92,7 +96,7 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     answer.why = "the environment cannot be read just now";
     return answer;
   }
-  const Storebag storebag = takeSection(whole.storebag, *environment, answer);
+  const Storebag storebag = takeSection(name, whole.storebag, *environment, answer);
   if (answer.kind != Kind::fetched) {
     const char* sectionName = sectionNameForEnvironment(*environment);
     logError(
@@ -133,7 +137,7 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
   if (!environment) return kept;
   kept.known = true;
-  takeSection(whole.value(), *environment, kept.answer);
+  takeSection(name, whole.value(), *environment, kept.answer);
   if (kept.answer.kind != StorebagAnswer::Kind::fetched) return kept;
   kept.answer.maxAge = stored.value()->maxAge;
   kept.answer.lastModified = std::move(stored.value()->lastModified);

@@ -6,6 +6,7 @@
 
 #include "base/version.h"
 #include "daemon/doctor.h"
+#include "daemon/history_answers.h"
 #include "daemon/refresh.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
@@ -41,6 +42,13 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kSetConfig, Right::control, &Observers::setPreference},
       {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
       {question::kRefresh, Right::control, &Observers::refresh},
+      {question::kPrivacy, Right::control, &Observers::privacy},
+      {question::kTurnReportingOff, Right::control, &Observers::turnReportingOff},
+      {question::kTurnReportingOn, Right::control, &Observers::turnReportingOn},
+      {question::kResetIdentifiers, Right::control, &Observers::resetIdentifiers},
+      {question::kHistory, Right::control, &Observers::history},
+      {question::kHistoryBody, Right::control, &Observers::historyBody},
+      {question::kPurgeHistory, Right::control, &Observers::purgeHistory},
       {question::kDoctor, Right::observe, nullptr, &Observers::doctor},
   };
   for (const Question& question : kQuestions) {
@@ -95,11 +103,12 @@ class Observers::Desk final : public ipc::Observer {
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
-                     double started)
+                     Privacy& privacy, double started)
     : _services(services),
       _agent(agent),
       _clients(clients),
       _doctor(doctor),
+      _privacy(privacy),
       _started(started),
       _preferences(services.preferences, services.device) {}
 
@@ -165,6 +174,18 @@ Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection
     types.push_back(*type);
   }
   return _doctor.examine(caller, _agent.storebags(), types);
+}
+
+Observers::Answer Observers::history(const Dictionary& arguments) {
+  return historyPage(_services.history, arguments);
+}
+
+Observers::Answer Observers::historyBody(const Dictionary& arguments) {
+  return daemon::historyBody(_services.history, arguments);
+}
+
+Observers::Answer Observers::purgeHistory(const Dictionary&) {
+  return daemon::purgeHistory(_services.history);
 }
 
 Gauges Observers::gauges() {

@@ -9,6 +9,7 @@
 #include "base/value.h"
 #include "config/preference_editor.h"
 #include "daemon/metrics.h"
+#include "daemon/privacy.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
 
@@ -26,7 +27,8 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, double started);
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
+            double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -52,12 +54,20 @@ class Observers final : public ipc::ListenerDelegate {
   Answer unsetPreference(const Dictionary& arguments);
   Answer refresh(const Dictionary& arguments);
   Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
+  Answer privacy(const Dictionary&) { return _privacy.show(); }
+  Answer turnReportingOff(const Dictionary&) { return _privacy.turnOff(); }
+  Answer turnReportingOn(const Dictionary&) { return _privacy.turnOn(); }
+  Answer resetIdentifiers(const Dictionary&) { return _privacy.resetIdentifiers(); }
+  Answer history(const Dictionary& arguments);
+  Answer historyBody(const Dictionary& arguments);
+  Answer purgeHistory(const Dictionary& arguments);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
   Doctor& _doctor;
+  Privacy& _privacy;
   const double _started;
   config::PreferenceEditor _preferences;
 };

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -50,6 +51,9 @@ std::vector<std::string> reportingNames(const BackendSet& backends);
 
 // The hierarchy number of the HTTPS post back end; 0, which is a root, if there is none. Any thread.
 std::int32_t hierarchyOf(const BackendSet* backends);
+
+// The address at which reports can be viewed, if a back end has one.
+std::optional<std::string> displayURLOf(const BackendSet* backends);
 
 // Copies the states and sampling thresholds from the parent session's back ends. A held back end keeps its
 // own; one that the parent lacks is disabled. Called under the families' lock.

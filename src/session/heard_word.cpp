@@ -7,27 +7,45 @@ namespace veltrad::session {
 bool HeardWord::hear() {
   const std::uint64_t turn = _gate.turn();
   if (turn == _heard) return false;
+  auto word = _gate.word();
+  _reset = word->resets != _word->resets;
   _heard = turn;
-  _word = _gate.word();
+  _word = std::move(word);
   return true;
 }
 
-backends::SharedDictionary HeardWord::allowed(const backends::SharedDictionary& userInfo) const {
-  std::optional<Dictionary> changed;
-  const Dictionary* sent = allowed(userInfo.get(), changed);
-  return sent == userInfo.get() ? userInfo : std::make_shared<const Dictionary>(std::move(*changed));
+void HeardWord::takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41],
+                             const BackendSet* set) const {
+  if (_reset) device.copyUniqueDeviceID(deviceID, sizeof deviceID);
+  const bool always = _word->policy->rules().consent == config::ConsentRule::always;
+  for (const auto& [name, backend] : set ? *set : BackendSet()) {
+    if (_reset) backend->takeIdentity(deviceID);
+    if (always) backend->rereadConsent();
+  }
 }
 
-const Dictionary* HeardWord::allowed(const Dictionary* payload, std::optional<Dictionary>& changed) const {
-  if (!payload || !_word->fields) return payload;
-  config::EditedFields changes;
-  return _word->fields->apply(changed.emplace(*payload), changes) ? &*changed : payload;
+backends::UserInfo HeardWord::allowed(backends::SharedDictionary userInfo) const {
+  backends::UserInfo info{userInfo, userInfo, nullptr};
+  if (!userInfo || !_word->fields) return info;
+  Dictionary sent = *userInfo;
+  auto edits = std::make_shared<config::EditedFields>();
+  if (!_word->fields->apply(sent, *edits)) return info;
+  info.sent = std::make_shared<const Dictionary>(std::move(sent));
+  info.edits = std::move(edits);
+  return info;
 }
 
-void HeardWord::restrict(Array& logData) const {
-  if (!_word->fields) return;
-  config::EditedFields changes;
-  for (Value& element : logData) _word->fields->apply(element, changes);
+config::EditedFields HeardWord::restrict(std::optional<Dictionary>& payload) const {
+  config::EditedFields edits;
+  if (payload && _word->fields) _word->fields->apply(*payload, edits);
+  return edits;
+}
+
+config::EditedFields HeardWord::restrict(Array& logData) const {
+  config::EditedFields edits;
+  if (!_word->fields) return edits;
+  for (Value& element : logData) _word->fields->apply(element, edits);
+  return edits;
 }
 
 }  // namespace veltrad::session

@@ -23,14 +23,13 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   making.device.copyUniqueDeviceID(deviceID, sizeof deviceID);
   backends::SessionFacts facts;
   facts.device.udid = deviceID;
-  facts.userInfo = message.userInfo;
-  facts.sentUserInfo = message.sentUserInfo;
+  facts.take(message.userInfo);
   const auto set = createBackends(making, message.storebag, message.sessionInfo, std::move(facts));
   if (!set) {
     logError("sendMessageWithSessionInfo: No backends available to send single message");
     return;
   }
-  if (message.userInfo &&
+  if (message.userInfo.given &&
       !message.sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) {
     logWarning("sendMessageWithSessionInfo: user info provided without requiring it.");
   }
@@ -40,7 +39,7 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   for (const auto& [name, backend] : *set) {
     const auto [decision, answer] =
         backend->sendMessage(message.payload ? std::optional(*message.payload) : std::nullopt, time,
-                             message.category, message.type, 0);
+                             message.category, message.type, 0, message.note);
     if (message.outcomes) message.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }

@@ -12,12 +12,12 @@ namespace veltrad::session {
 // Pointers may be null.
 struct OneShotMessage {
   const Dictionary* sessionInfo = nullptr;
-  backends::SharedDictionary userInfo;
-  backends::SharedDictionary sentUserInfo;
+  backends::UserInfo userInfo;
   const config::StorebagSection* storebag = nullptr;
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   const Dictionary* payload = nullptr;
+  backends::MessageNote note = {};
   // Gets what became of the message, unless it is null because nobody waits for it.
   wire::Outcomes* outcomes = nullptr;
 };

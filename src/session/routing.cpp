@@ -17,8 +17,8 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, Message m
     const auto& [name, backend] = *next++;
     // The last one owns the payload alone, so that it need not copy what it changes.
     auto payload = next == backends.end() ? std::move(message.payload) : message.payload;
-    auto [decision, answer] =
-        backend->sendMessage(std::move(payload), message.time, message.category, message.type, message.flag);
+    auto [decision, answer] = backend->sendMessage(std::move(payload), message.time, message.category,
+                                                   message.type, message.flag, message.note);
     if (outcomes) outcomes->push_back({name, decision});
     if (!answer) continue;
     messageLog.writeToLogFile("[%@ -> sendMessageWithDictionary] %@", name, *answer);
@@ -70,10 +70,10 @@ bool uploadFile(const BackendSet* backends, const std::string& path, const std::
   return uploaded;
 }
 
-bool uploadLogDataArray(const BackendSet* backends, const Array& logData) {
+bool uploadLogDataArray(const BackendSet* backends, const Array& logData, const backends::MessageNote& note) {
   bool uploaded = false;
   if (backends) {
-    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadLogData(logData);
+    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadLogData(logData, note);
   }
   if (uploaded) {
     logDebug("uploadLogData: Log data array upload successful");

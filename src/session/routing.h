@@ -20,6 +20,7 @@ struct Message {
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   std::int32_t flag = 0;
+  backends::MessageNote note = {};
 };
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.
@@ -34,6 +35,6 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
 // These return whether a back end uploaded the data. `backends` may be null.
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
                 support::MessageLog& messageLog);
-bool uploadLogDataArray(const BackendSet* backends, const Array& logData);
+bool uploadLogDataArray(const BackendSet* backends, const Array& logData, const backends::MessageNote& note);
 
 }  // namespace veltrad::session

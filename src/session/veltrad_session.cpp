@@ -58,7 +58,8 @@ std::string VeltradSession::description() const {
 }
 
 FamilyFacts VeltradSession::familyFacts() const {
-  return {_aggregation, _sessionID, _sessionIDString, _userInfo, _backends, _sessionInfo, _sentUserInfo};
+  return {_aggregation, _sessionID,   _sessionIDString, _userInfo.given,
+          _backends,    _sessionInfo, _userInfo.sent};
 }
 
 std::optional<std::int32_t> VeltradSession::clientType() const {
@@ -92,15 +93,15 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
 
 void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
-  _userInfo = std::move(info);
-  _sentUserInfo = _word.allowed(_userInfo);
+  _userInfo = _word.allowed(std::move(info));
 }
 
 void VeltradSession::hearOwner() {
   while (_word.hear()) {
-    _sentUserInfo = _word.allowed(_userInfo);
+    _word.takeIdentity(_services.device, _deviceid, _backends.get());
+    _userInfo = _word.allowed(_userInfo.given);
     if (!_backends) continue;
-    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
     _leftFamily ? forbidByWord(*_backends, _word.now()) : updateSessionWithDefaultSessionInfo();
   }
 }
@@ -130,8 +131,7 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
   backends::SessionFacts facts;
   facts.device.udid = _deviceid;
-  facts.userInfo = _userInfo;
-  facts.sentUserInfo = _sentUserInfo;
+  facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
   auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock,
                               _services.counters, _word.now(), _account},
@@ -168,7 +168,7 @@ void VeltradSession::fetchStatesWithUserInfo(wire::OptionalDictionary userInfo,
 }
 
 void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
-  const backends::SharedDictionary current = _userInfo;
+  const backends::SharedDictionary current = _userInfo.given;
   if (!updated) {
     if (!current) return;
     if (_sessionInfo && _sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false))
@@ -179,7 +179,7 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
                          sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
   keepUserInfo(std::move(updated));
   if (_backends) {
-    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo, _sentUserInfo);
+    for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
   }
   if (unchanged) return _sessionDelegate.sessionInfoUpdated(familyFacts());
   logDebug("receivedUserInfo: Received new user info for session %u", _sessionID);
@@ -188,18 +188,7 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
 
 void VeltradSession::fetchDisplayURL(wire::StringReply reply) {
   logDebug("fetchDisplayURL: Fetching display URL for session %u", _sessionID);
-  std::string url = "URL not available";
-  if (_backends) {
-    for (const char* name :
-         {wire::kVeltraBackendHTTPPost, wire::kVeltraBackendHTTPPost2, wire::kVeltraBackendDashboard}) {
-      const auto at = _backends->find(name);
-      const auto display = at == _backends->end() ? std::nullopt : at->second->displayURL();
-      if (!display) continue;
-      url = *display;
-      break;
-    }
-  }
-  if (reply) reply(url);
+  if (reply) reply(displayURLOf(_backends.get()).value_or("URL not available"));
 }
 
 void VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
@@ -260,9 +249,8 @@ bool VeltradSession::hasBackends(Origin origin) {
 
 // Sets the message's time. There are back ends.
 std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Outcomes* outcomes) {
-  std::optional<Dictionary> changed;
-  if (message.payload) _word.allowed(&*message.payload, changed);
-  if (changed) message.payload = std::move(changed);
+  const config::EditedFields edits = _word.restrict(message.payload);
+  message.note = {&edits};
   message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
   sayWithoutUserInfo();
@@ -281,17 +269,17 @@ void VeltradSession::internalSendMessage(const Dictionary& payload, std::uint16_
 void VeltradSession::sayWithoutUserInfo() {
   if (_saidWithoutUserInfo) return;
   _saidWithoutUserInfo = true;
-  if (_userInfo) return;
+  if (_userInfo.given) return;
   logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", _sessionID);
 }
 
 void VeltradSession::aggregateMessage(std::int32_t hierarchy, const Message& message) {
-  const FamilyPlace place{*_aggregation, _userInfo, hierarchy};
+  const FamilyPlace place{*_aggregation, _userInfo.given, hierarchy};
   // A root has no ancestors, so it does not need the families' lock.
   const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
   if (!toAncestor && !_aggregation->active()) return;
   const std::string copy =
-      aggregatedCopy(_sessionInfo, _sentUserInfo, platform::timevalToSeconds(message.time), message.category,
+      aggregatedCopy(_sessionInfo, _userInfo.sent, platform::timevalToSeconds(message.time), message.category,
                      message.type, message.payload ? &*message.payload : nullptr);
   CopySent sent;
   if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
@@ -315,8 +303,8 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   hearOwner();
-  _word.restrict(logData);
-  const bool uploaded = uploadLogDataArray(_backends.get(), logData);
+  const config::EditedFields edits = _word.restrict(logData);
+  const bool uploaded = uploadLogDataArray(_backends.get(), logData, {&edits});
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
 
@@ -348,14 +336,20 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
   hearOwner();
-  std::optional<Dictionary> changed;
+  const config::EditedFields edits = _word.restrict(payload);
   wire::Outcomes outcomes;
   veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
        _word.now(), _account, true},
       _services.messageLog,
-      {kept.get(), identity, _word.allowed(identity), storebag.get(), category, type,
-       _word.allowed(payload ? &*payload : nullptr, changed), reply ? &outcomes : nullptr});
+      {kept.get(),
+       _word.allowed(identity),
+       storebag.get(),
+       category,
+       type,
+       payload ? &*payload : nullptr,
+       {&edits},
+       reply ? &outcomes : nullptr});
   if (reply) reply("finished", std::move(outcomes));
 }
 
@@ -371,7 +365,7 @@ void VeltradSession::end() {
   if (const auto line = _aggregation->end()) logError("%s", line->c_str());
   const auto released = std::exchange(_backends, nullptr);
   _sessionInfo = nullptr;
-  _userInfo = nullptr;
+  _userInfo = {};
   _storebagVersion = std::nullopt;
   if (released) {
     for (const auto& [name, backend] : *released) backend->cleanup();

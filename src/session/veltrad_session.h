@@ -124,9 +124,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   bool _saidWithoutUserInfo = false;
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
-  backends::SharedDictionary _userInfo;
-  // What of it may leave the device.
-  backends::SharedDictionary _sentUserInfo;
+  backends::UserInfo _userInfo;
   HeardWord _word;
   // It must not join its family again.
   bool _leftFamily = false;

@@ -25,11 +25,18 @@ inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:"
 namespace question {
 inline constexpr const char* kConfig = "config";
 inline constexpr const char* kDoctor = "doctor";
+inline constexpr const char* kHistory = "history";
+inline constexpr const char* kHistoryBody = "historyBody";
 inline constexpr const char* kMetrics = "metrics";
+inline constexpr const char* kPrivacy = "privacy";
+inline constexpr const char* kPurgeHistory = "purgeHistory";
 inline constexpr const char* kRefresh = "refresh";
+inline constexpr const char* kResetIdentifiers = "resetIdentifiers";
 inline constexpr const char* kSessions = "sessions";
 inline constexpr const char* kSetConfig = "setConfig";
 inline constexpr const char* kStatus = "status";
+inline constexpr const char* kTurnReportingOff = "turnReportingOff";
+inline constexpr const char* kTurnReportingOn = "turnReportingOn";
 inline constexpr const char* kUnsetConfig = "unsetConfig";
 inline constexpr const char* kVersions = "versions";
 }  // namespace question

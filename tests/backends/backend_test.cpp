@@ -45,7 +45,8 @@ TEST(VeltraBackend, ItsFactsChangeAsAWholeAndOnlyWhereTheyAreToldTo) {
     for (int i = 0; i <= 1000; ++i) backend.setCorrelatedSessionID("ancestor." + std::to_string(i));
   });
   for (int i = 0; i <= 1000; ++i)
-    backend.setUserInfoDict(std::make_shared<const Dictionary>(Dictionary{{"number", i}}), nullptr);
+    backend.setUserInfoDict(
+        {std::make_shared<const Dictionary>(Dictionary{{"number", i}}), nullptr, nullptr});
   other.join();
   const auto now = backend.facts();
   EXPECT_EQ(now->sessionID, 7u);

@@ -67,15 +67,20 @@ TEST(FilterTable, TheFirstRecordThatFitsDecidesAndAnEmptyArrayChangesNothing) {
     table.createFiltersFromArray(given);
     table.createFiltersFromArray({});
     Dictionary filtered = before;
-    table.filterEvent(filtered);
+    config::EditedFields edits;
+    const auto outcome = table.filterEvent(filtered, edits);
     EXPECT_EQ(filtered, after) << formats::writeJSON(filters);
+    EXPECT_EQ(outcome.removed, edits.removed.size());
+    for (const std::string& name : edits.removed) EXPECT_TRUE(before.contains(name) && !after.contains(name));
   }
   const auto first = parsed({filter("mac", "remove")}), second = parsed({filter("other", "remove")});
   backends::FilterTable table;
   table.createFiltersFromArray(first);
   table.createFiltersFromArray(second);
   Dictionary kept = event;
-  EXPECT_EQ(table.filterEvent(kept).removed, 0u);
+  config::EditedFields edits;
+  EXPECT_EQ(table.filterEvent(kept, edits).removed, 0u);
+  EXPECT_TRUE(edits.empty());
 }
 
 }  // namespace

@@ -91,7 +91,9 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, server.host(), making.gate};
+  const std::string host = server.host();
+  const std::string to = "udp://" + host + ":" + std::to_string(ntohs(server.address->sin_port));
+  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, host, to, making.gate};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
@@ -148,7 +150,15 @@ DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::str
       _clock(making.clock),
       _counters(making.counters),
       _usingProfile(profile != nullptr),
-      _postURL(profile ? profile->postURL : std::nullopt) {}
+      _postURL(profile ? profile->postURL : std::nullopt),
+      _gate(making.gate) {}
+
+DatagramOwner DashboardBackend::owner(const MessageNote& note) const {
+  const auto facts = this->facts();
+  if (!_gate || !_gate->keepsRecords()) return {facts->client, {}};
+  return {facts->client,
+          aboutDeparture(name(), *facts, std::nullopt, note.edits ? *note.edits : config::EditedFields())};
+}
 
 std::vector<std::string> DashboardBackend::hosts() const {
   return {_networkProcQueue->host()};
@@ -177,7 +187,7 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
 
   std::string line = writeLocalLog(packet);
   const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
-  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID), std::move(line)};
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note)), std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
@@ -202,12 +212,12 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
   return header;
 }
 
-bool DashboardBackend::uploadLogData(const Array& logData) {
+bool DashboardBackend::uploadLogData(const Array& logData, const MessageNote& note) {
   if (prohibition()) {
     _counters.count(wire::Reason::log_data_refused_by_owner);
     return false;
   }
-  const auto location = _uploads.upload(_postURL, logData);
+  const auto location = _uploads.upload(_postURL, logData, owner(note));
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
   sendMessage(payload, _clock.now(), 0, 2, 0);

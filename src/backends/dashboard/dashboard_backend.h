@@ -56,9 +56,11 @@ class DashboardBackend final : public VeltraBackend {
 
   // The text is the dashboard text line of the message.
   Sent sendNumberedMessage(NumberedMessage&& message) override;
-  bool uploadLogData(const Array& logData) override;
+  bool uploadLogData(const Array& logData, const MessageNote& note) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;
+  // Datagrams with the identifier before do not go on.
+  void dropIdentified() override { dropWaiting(); }
 
  private:
   void dropWaiting() override;
@@ -67,12 +69,14 @@ class DashboardBackend final : public VeltraBackend {
                    const config::DashboardProfile* profile, const std::string& productFamily);
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
+  DatagramOwner owner(const MessageNote& note) const;
 
   LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
   const bool _usingProfile;
   const std::optional<std::string> _postURL;
+  config::OwnerGate* const _gate;
   std::shared_ptr<NetworkProcQueue> _networkProcQueue;
 
   // The session's thread only.

@@ -25,7 +25,7 @@ std::optional<std::string> archiveOf(const Array& logData) {
 }  // namespace
 
 std::optional<std::string> LogDataUploads::upload(const std::optional<std::string>& postURL,
-                                                  const Array& logData) {
+                                                  const Array& logData, const DatagramOwner& owner) {
   if (!postURL) {
     logError("DashboardBackend(uploadLogData): Post URL for log data array is nil");
     _counters.count(wire::Reason::log_data_no_address);
@@ -37,7 +37,7 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
     _counters.count(wire::Reason::log_data_no_memory);
     return std::nullopt;
   }
-  const auto body = post(*postURL, std::move(*archive));
+  const auto body = post(*postURL, std::move(*archive), owner);
   if (!body.ok() || body.value().empty()) {
     logError("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
              body.ok() ? "" : body.error().c_str());
@@ -50,13 +50,16 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
   return location;
 }
 
-Result<std::string, std::string> LogDataUploads::post(const std::string& url, std::string archive) {
+Result<std::string, std::string> LogDataUploads::post(const std::string& url, std::string archive,
+                                                      const DatagramOwner& owner) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::logData;
   request.url = url;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body = std::move(archive);
+  request.client = owner.client;
+  request.about = owner.about;
   request.mostResponseBytes = kMostLogAnswerBytes;
   http::HTTPResult result = _http.perform(std::move(request));
   if (!result.ok()) return Failure{result.error().description};

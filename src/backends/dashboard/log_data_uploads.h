@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 
+#include "backends/dashboard/udp_packet_to_send.h"
 #include "base/result.h"
 #include "base/value.h"
 #include "http/http_client.h"
@@ -20,11 +21,13 @@ class LogDataUploads {
 
   // Returns the location in the server's answer, whatever its status. Nothing, after one error line, if there
   // is no answer or it is empty.
-  std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData);
+  std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData,
+                                    const DatagramOwner& owner = {});
 
  private:
   // Returns the answer's body, or why there is none.
-  Result<std::string, std::string> post(const std::string& url, std::string archive);
+  Result<std::string, std::string> post(const std::string& url, std::string archive,
+                                        const DatagramOwner& owner);
 
   http::HTTPClient& _http;
   platform::Counters& _counters;

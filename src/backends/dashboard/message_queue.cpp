@@ -13,27 +13,38 @@ constexpr int checksBeforeRetransmit[] = {2, 3, 5, 9};
 constexpr int kMostRetransmits = static_cast<int>(std::size(checksBeforeRetransmit));
 static_assert(checksBeforeRetransmit[kMostRetransmits - 1] == SentCopies::kTicks);
 // Room for five transmissions of each datagram that waits, and as many of those that no longer do.
+constexpr const char* kNotAcknowledged = "not acknowledged";
+constexpr const char* kNoMemory = "no memory to await its acknowledgement";
 constexpr std::size_t kMostCopies = MessageQueue::maxPendingSharedPackets * 2 * (kMostRetransmits + 1);
 }  // namespace
 
-MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send)
+MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder recorder)
     : _reliableUDP(reliableUDP),
       _most(shared ? maxPendingSharedPackets : maxPendingPackets),
-      _send(std::move(send)) {
+      _send(std::move(send)),
+      _recorder(std::move(recorder)) {
   if (shared) _copies.emplace(kMostCopies);
 }
 
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                                               std::optional<platform::Charge> charge) {
+                                               std::optional<platform::Charge> charge,
+                                               const DatagramOwner& owner) {
   const bool sent = _send(datagram);
+  const std::uint64_t record = sent ? recordSent(datagram, owner) : 0;
   First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt};
-  if (sent && !_reliableUDP) return result;
+  const bool waits = !sent || _reliableUDP;
+  if (sent && _recorder.ended && (!waits || !charge))
+    _recorder.ended(record, datagram.size(), 1, waits ? kNoMemory : "");
+  if (!waits) return result;
   if (!charge)
     return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt};
   const auto state = sent ? UDPPacketToSend::awaitsAcknowledgement : UDPPacketToSend::notSent;
   _pending.push_back({std::string(datagram), eventNumber, ++_lastSerial, std::move(*charge), state});
+  _pending.back().owner = owner;
+  _pending.back().record = record;
   if (sent && _copies) _copies->sent(_lastSerial, eventNumber);
   if (_pending.size() > _most) {
+    recordEnd(_pending.front(), kNotAcknowledged);
     _pending.pop_front();
     result.pushedOut = _copies ? wire::Reason::shared_datagrams_wait : wire::Reason::datagrams_wait;
   }
@@ -60,12 +71,15 @@ bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (!send(record)) return false;
   ++result.sent;
   record.state = UDPPacketToSend::awaitsAcknowledgement;
+  record.record = recordSent(record.data, record.owner);
+  if (!_reliableUDP) recordEnd(record, "");
   return !_reliableUDP;
 }
 
 bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   if (record.numberOfRetransmits >= kMostRetransmits) {
     ++result.givenUp;
+    recordEnd(record, kNotAcknowledged);
     return true;
   }
   const int checks = record.numberOfChecks + 1;
@@ -77,6 +91,23 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
     ++result.sentAgain;
   }
   return false;
+}
+
+void MessageQueue::clear(const std::function<void(const UDPPacketToSend&)>& drop) {
+  for (const UDPPacketToSend& record : _pending) {
+    recordEnd(record, kNotAcknowledged);
+    if (drop) drop(record);
+  }
+  _pending.clear();
+}
+
+std::uint64_t MessageQueue::recordSent(std::string_view datagram, const DatagramOwner& owner) const {
+  return _recorder.sent ? _recorder.sent(datagram, owner) : 0;
+}
+
+void MessageQueue::recordEnd(const UDPPacketToSend& record, const char* error) const {
+  if (_recorder.ended && record.state != UDPPacketToSend::notSent)
+    _recorder.ended(record.record, record.data.size(), record.transmissions(), error);
 }
 
 std::size_t MessageQueue::notSent() const {
@@ -91,6 +122,7 @@ bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
     return _copies ? answered == one.serial : one.eventNumber == eventNumber;
   });
   if (record == _pending.end()) return false;
+  recordEnd(*record, "");
   _pending.erase(record);
   return true;
 }

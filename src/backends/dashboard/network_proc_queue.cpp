@@ -47,9 +47,13 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _account(std::move(account)),
       _queues(std::move(queues)),
       _socket(std::move(socket)),
-      _messageQueue(kind.reliableUDP, kind.shared,
-                    [this](std::string_view datagram)
-                        REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); }),
+      _messageQueue(
+          kind.reliableUDP, kind.shared,
+          [this](std::string_view datagram) REQUIRES(_mutex) {
+            const bool room = !_kind.gate || _kind.gate->hasRoomForRecord();
+            return room && mayLeave(0, datagram.size()) && _socket.send(datagram);
+          },
+          recorder()),
       _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
@@ -66,7 +70,8 @@ bool NetworkProcQueue::startReading(WorkPool& pool) {
   return _readSource != nullptr;
 }
 
-wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
+wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
+                                              const DatagramOwner& owner) {
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
@@ -78,7 +83,8 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
     _counters.count(wire::Reason::datagram_over_daily_limit);
     return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
-  const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
+  const MessageQueue::First first =
+      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner);
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
@@ -88,6 +94,23 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
 
 bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
   return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
+}
+
+MessageQueue::Recorder NetworkProcQueue::recorder() const {
+  config::OwnerGate* const gate = _kind.gate;
+  if (!gate) return {};
+  const auto sent = [gate, to = _kind.address](std::string_view datagram, const DatagramOwner& owner) {
+    gate->datagramLeft(to, 1, datagram.size());
+    if (!gate->keepsRecords()) return std::uint64_t{0};
+    return gate->record({http::Departure::Kind::datagram, to, 1, datagram.size(), owner.client, owner.about},
+                        {}, datagram, nullptr);
+  };
+  const auto ended = [gate, to = _kind.address](std::uint64_t record, std::size_t bytes, int transmissions,
+                                                const char* error) {
+    if (transmissions > 1) gate->datagramLeft(to, 0, bytes * static_cast<std::size_t>(transmissions - 1));
+    gate->ended(record, {0, error, transmissions});
+  };
+  return {sent, ended};
 }
 
 // Batched events are dropped for a datagram that will wait for its acknowledgement, but not for one that
@@ -135,7 +158,9 @@ void NetworkProcQueue::end() {
 void NetworkProcQueue::dropWaiting() {
   const Lock held(_mutex);
   _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
-  _messageQueue.clear();
+  _messageQueue.clear([this](const UDPPacketToSend& waiting) {
+    if (_kind.gate) _kind.gate->receipt().add(http::Departure::Kind::datagram, waiting.owner.client, 1);
+  });
 }
 
 // `reason` applies to the datagrams that were sent.

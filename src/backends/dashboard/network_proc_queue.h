@@ -43,6 +43,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::chrono::milliseconds period{};
     // The dashboard's address, for those who ask whether it may be reached.
     std::string host;
+    std::string address;  // "udp://IP:PORT"
     // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
     config::OwnerGate* gate = nullptr;
   };
@@ -56,7 +57,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // From now on acknowledgements are read. False if they cannot be.
   bool startReading(WorkPool& pool);
   // Called without a lock, because older data of the user may be dropped to make room.
-  wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber);
+  wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
+                              const DatagramOwner& owner = {});
   // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
@@ -77,7 +79,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
+  // `events`: 1 for one that is to leave, without its bytes, which each transmission counts.
   bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
+  MessageQueue::Recorder recorder() const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);

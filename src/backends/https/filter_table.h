@@ -3,9 +3,14 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
 
 #include "base/value.h"
 #include "config/client_entry.h"
+#include "config/field_changes.h"
 
 namespace veltrad::backends {
 
@@ -20,8 +25,17 @@ class FilterTable {
     std::size_t removed = 0;
     std::size_t hashed = 0;
   };
-  // Filters the event in place by its own "_method" and "_status" (0 if missing).
-  Outcome filterEvent(Dictionary& event) const;
+  // Filters the event in place by its own "_method" and "_status" (0 if missing). `changes` hears the names.
+  Outcome filterEvent(Dictionary& event, config::FieldChanges& changes) const;
+  // True if every field is kept.
+  bool empty() const { return !_filters || _filters->ofKey.empty(); }
+  // What happens to a field of an event with this method and status. Not empty().
+  config::FilterAction actionOn(std::string_view key, std::int32_t method, std::int32_t status) const;
+  // The digest of a text, or of the JSON text of a number or boolean. Nothing for other values, which are
+  // then removed, because a field that is to be hashed must never leave in clear.
+  static std::optional<std::string> digestOf(const Value& value);
+  // The same filters.
+  bool operator==(const FilterTable&) const = default;
 
  private:
   const config::Filters* _filters = nullptr;

@@ -30,6 +30,7 @@ StateVerdict HTTPSPostState::updateBackendState() {
     return matchClientNameAndServiceID(candidate, clientName, serviceName);
   });
   const bool found = entry != clients.end();
+  _entry = found ? std::optional(static_cast<std::size_t>(entry - clients.begin())) : std::nullopt;
   if (found) applyExpedite(*entry);
   if (!facts->requireUserInfo) return reportForEveryone();
   if (!userInfo) return counted(kBackendWaiting, wire::Reason::waits_for_user_info);
@@ -46,6 +47,8 @@ StateVerdict HTTPSPostState::reportForEveryone() {
   const auto taken =
       std::find_if(clients.begin(), clients.end(),
                    [this](const config::ClientEntry& candidate) { return _links.updatePostLink(candidate); });
+  _entry.reset();
+  if (taken != clients.end()) _entry = static_cast<std::size_t>(taken - clients.begin());
   resetBackendStateWithClient(taken == clients.end() ? nullptr : &*taken);
   return {kBackendReporting, wire::Reason::no_user_info_required};
 }

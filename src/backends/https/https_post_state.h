@@ -37,10 +37,14 @@ class HTTPSPostState {
   StateVerdict updateBackendState();
 
   bool batchEvents(const SessionFacts& facts) const { return _batchEvents.value_or(facts.batchEvents); }
+  void renewIdentifiers() { _identity.renewIdentifiers(); }
+  void rereadConsent() { _identity.rereadConsent(); }
   const PostIdentity& identity() const { return _identity; }
   const PostLinks& links() const { return _links; }
   const FilterTable& filters() const { return _filters; }
   std::int32_t eventThreshold() const { return _eventThreshold; }
+  // The number of the client entry that holds; nothing: none does.
+  std::optional<std::size_t> entry() const { return _entry; }
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
 
  private:
@@ -65,6 +69,7 @@ class HTTPSPostState {
   // From an entry's "expedite".
   std::optional<bool> _batchEvents;
   std::int32_t _eventThreshold = 49;
+  std::optional<std::size_t> _entry;
   std::optional<double> _overrideSampling;
 };
 

@@ -85,7 +85,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
   const auto facts = this->facts();
-  const auto place = _uploads.enter(userOf(facts->account), _http);
+  auto place = _uploads.enter(userOf(facts->account), _http, facts->client);
   if (!place) {
     sayStopping();
     return false;
@@ -99,6 +99,9 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
     return false;
   }
   gzipped.become(*request);
+  request->client = facts->client;
+  request->about = aboutDeparture(name(), *facts, std::nullopt, {});
+  place->requests();
   if (confirms(_http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
 }

@@ -5,7 +5,9 @@
 
 #include "tools/ctl/config_command.h"
 #include "tools/ctl/doctor_command.h"
+#include "tools/ctl/history_command.h"
 #include "tools/ctl/options.h"
+#include "tools/ctl/privacy_command.h"
 #include "tools/ctl/refresh_command.h"
 #include "tools/ctl/report_command.h"
 #include "tools/ctl/send_command.h"
@@ -43,6 +45,15 @@ int run(int argc, char** argv) {
       return runRefresh(options);
     case Command::report:
       return runReport(options);
+    case Command::privacy:
+    case Command::privacyOff:
+    case Command::privacyOn:
+    case Command::privacyReset:
+      return runPrivacy(options);
+    case Command::history:
+    case Command::historyShow:
+    case Command::historyPurge:
+      return runHistory(options);
     case Command::session:
       return runSession(options, interrupt);
     default:

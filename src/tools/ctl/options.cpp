@@ -13,6 +13,7 @@
 #include "base/text.h"
 #include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
+#include "tools/ctl/owner_options.h"
 #include "tools/key_value.h"
 #include "veltra/veltra.h"
 #include "wire/constants.h"
@@ -22,7 +23,7 @@ namespace {
 
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
-    "metrics, doctor, config, refresh or report";
+    "metrics, doctor, config, refresh, report, privacy or history";
 
 // Arguments in text form.
 struct Texts {
@@ -292,6 +293,7 @@ void describe(CLI::App& app, Options& options, Texts& texts) {
   addQuestions(app, options, texts);
   addUploads(app, options, texts);
   addCare(app, options);
+  addOwner(app, options);
 }
 
 }  // namespace

@@ -44,7 +44,14 @@ enum class Command {
   configSet,
   configUnset,
   refresh,
-  report
+  report,
+  privacy,
+  privacyOff,
+  privacyOn,
+  privacyReset,
+  history,
+  historyShow,
+  historyPurge
 };
 
 // Of the commands for those who look after a device.
@@ -52,12 +59,16 @@ struct Care {
   bool watch = false;
   // doctor.
   std::vector<std::int32_t> clientTypes;
-  // config: a preference's name; refresh: a storebag's, empty for all.
+  // config: a preference's name; refresh: a storebag's, empty for all; history show: a record's.
   std::string key;
   std::string value;
   // report: the file to write.
   std::optional<std::string> output;
   bool yes = false;
+  // history show: the bytes as they left.
+  bool raw = false;
+  // history: the page to write.
+  std::optional<std::string> html;
 };
 
 // Its 13 fields are the command's options and arguments, by name.
