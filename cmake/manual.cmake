@@ -32,7 +32,7 @@ endfunction()
 
 file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
 veltra_manual_pages(daemon veltrad.8 veltrad.5)
-veltra_manual_pages(tools veltractl.1 veltra-storebag.1 veltra-storebag.5)
+veltra_manual_pages(tools veltractl.1 veltra-storebag.1 veltra-storebag.5 veltra-storebag.7)
 veltra_manual_pages(development libveltra.3 libveltra-testing.3)
 if(VELTRA_LAB)
   veltra_manual_pages(lab veltra-lab.1)

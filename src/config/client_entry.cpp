@@ -12,6 +12,8 @@ using enum Need;
 
 constexpr const char* kRefusesEveryone = "refuses every client that requires user info";
 constexpr Range kShare{0, 1};
+constexpr Range kFromZero{0, kInt32.most};
+constexpr Range kCodeOrAll{-1, kInt32.most};
 
 constexpr auto kFilterKeys = keysOf<filterTag>({
     row<&filterTag::key>({"key", text, kUnbounded, required, "matches nothing",
@@ -19,10 +21,12 @@ constexpr auto kFilterKeys = keysOf<filterTag>({
     row<&filterTag::action>({"action", text, kUnbounded, optional, "the field is kept",
                              "\"remove\" takes the field out, \"sha256\" replaces its value by the digest of "
                              "it, any other text keeps it."}),
-    row<&filterTag::method>({"method", integer, kInt32, optional, "-1",
-                             "The filter holds for events of this method; a negative one for all."}),
-    row<&filterTag::status>({"status", integer, kInt32, optional, "-1",
-                             "The filter holds for events of this status; a negative one for all."}),
+    row<&filterTag::method>(
+        sensibly(kCodeOrAll, {"method", integer, kInt32, optional, "-1",
+                              "The filter holds for events of this method; a negative one for all."})),
+    row<&filterTag::status>(
+        sensibly(kCodeOrAll, {"status", integer, kInt32, optional, "-1",
+                              "The filter holds for events of this status; a negative one for all."})),
 });
 
 constexpr auto kCountryThresholdKeys = keysOf<CountryThreshold>({
@@ -41,9 +45,10 @@ constexpr auto kClientEntryKeys = keysOf<ClientEntry>({
                                 "case is ignored."}),
     row<&ClientEntry::expedite>({"expedite", real, kUnbounded, optional, "as the session says",
                                  "0 batches events, any other number posts each at once."}),
-    row<&ClientEntry::hierarchy>({"hierarchy", integer, kInt32, optional, "0",
-                                  "Level of the session among those of the same client and service; 0 is the "
-                                  "root."}),
+    row<&ClientEntry::hierarchy>(
+        sensibly(kFromZero, {"hierarchy", integer, kInt32, optional, "0",
+                             "Level of the session among those of the same client and service; 0 is the "
+                             "root."})),
     row<&ClientEntry::overrideDNU>({"override_dnu", integer, kInt32, optional, "0",
                                     "1 reports without the user's consent, too; any other number does not."}),
     row<&ClientEntry::localeWhitelist>({"locale_whitelist", texts, kUnbounded, required, kRefusesEveryone,

@@ -58,7 +58,14 @@ struct Key {
   // read the key.
   void (*read)(const Key&, const Value&, void* parsed) = nullptr;
   const char* choices = nullptr;  // the texts of a choice, "|" between them
+  // What has a meaning, for tools; the daemon reads all of `range`. Unbounded: as `range`.
+  Range sensible = {};
 };
+
+constexpr Key sensibly(Range range, Key key) {
+  key.sensible = range;
+  return key;
+}
 
 struct KeyTable : std::span<const Key> {
   template <std::size_t N>

@@ -12,28 +12,30 @@ using enum Need;
 
 constexpr Range kPort{0, 65'535};
 constexpr Range kRefreshCycle{kInt32.least, 86'400};
+constexpr Range kSerial{0, 9'007'199'254'740'991.0};  // what every reader of JSON takes exactly
 
 constexpr auto kHTTPSPostKeys = keysOf<HTTPSPostProfile>({
+    row<&HTTPSPostProfile::displayURL>(
+        {"display_url", text, kUnbounded, optional, "none", "Address that clients may show to their user."}),
     row<&HTTPSPostProfile::clients>(
         {"clients", dictionaries, kUnbounded, required, "the back end is left out",
          "Client entries; the first that fits the client counts.", &ClientEntry::kKeys}),
-    row<&HTTPSPostProfile::displayURL>(
-        {"display_url", text, kUnbounded, optional, "none", "Address that clients may show to their user."}),
 });
 
 constexpr auto kDashboardKeys = keysOf<DashboardProfile>({
     row<&DashboardProfile::ip>({"ip", text, kUnbounded, required, "the back end is left out",
                                 "IPv4 address of the server, in decimal."}),
     row<&DashboardProfile::port>(
-        {"port", integer, kPort, required, "the back end is left out", "UDP port of the server."}),
+        sensibly({1, kPort.most},
+                 {"port", integer, kPort, required, "the back end is left out", "UDP port of the server."})),
     row<&DashboardProfile::displayURL>(
         {"display_url", text, kUnbounded, optional, "none", "Address that clients may show to their user."}),
     row<&DashboardProfile::postURL>(
         {"post_url", url, kUnbounded, optional, "log data is not uploaded", "Where log data is posted."}),
-    row<&DashboardProfile::reliable>(
-        {"reliable", presence, kInt32, optional, "without acknowledgements",
-         "Any value switches acknowledgements and retransmission on; a number "
-         "from 1 on is the period of the timer in milliseconds, else it is 500."}),
+    row<&DashboardProfile::reliable>(sensibly(
+        {50, kInt32.most}, {"reliable", presence, kInt32, optional, "without acknowledgements",
+                            "Any value switches acknowledgements and retransmission on; a number "
+                            "from 1 on is the period of the timer in milliseconds, else it is 500."})),
 });
 
 constexpr auto kUploadKeys = keysOf<UploadProfile>({
@@ -73,6 +75,20 @@ constexpr auto kSectionKeys = keysOf<StorebagSection>({
 });
 
 constexpr auto kStorebagKeys = keysOf<Storebag>({
+    row<&Storebag::version>({"version", text, kUnbounded, required, "events do not say which they follow",
+                             "Text that names this state of the storebag in events."}),
+    row<&Storebag::refreshCycle>(
+        sensibly({0, kRefreshCycle.most},
+                 {"refresh_cycle", integer, kRefreshCycle, optional, "what the server's Cache-Control says",
+                  "Seconds for which a fetched storebag stays fresh."})),
+    {{"serial", integer, kSerial, optional, "none",
+      "Number that grows with each state of the storebag. Not read by this version."}},
+    {{"expires", text, kUnbounded, optional, "it never expires",
+      "Date, or date and time, after which it is not to be used. Not read by this version."}},
+    {{"name", text, kUnbounded, optional, "none",
+      "Name that the storebag is served under. Not read by this version."}},
+    {{"revoked", texts, kUnbounded, optional, "none",
+      "SHA-256 digests of keys that are no longer to be taken. Not read by this version."}},
     row<&Storebag::development>({"development", dictionary, kUnbounded, optional, "no back ends there",
                                  "Back ends of the development environment.", &StorebagSection::kKeys}),
     row<&Storebag::flornInternal>({"florn_internal", dictionary, kUnbounded, optional, "no back ends there",
@@ -82,11 +98,6 @@ constexpr auto kStorebagKeys = keysOf<Storebag>({
     row<&Storebag::release>({"release", dictionary, kUnbounded, required,
                              "most devices get nothing, and those of \"seed\" have nothing to fall back on",
                              "Back ends of the release environment.", &StorebagSection::kKeys}),
-    row<&Storebag::version>({"version", text, kUnbounded, required, "events do not say which they follow",
-                             "Text that names this state of the storebag in events."}),
-    row<&Storebag::refreshCycle>({"refresh_cycle", integer, kRefreshCycle, optional,
-                                  "what the server's Cache-Control says",
-                                  "Seconds for which a fetched storebag stays fresh."}),
 });
 
 }  // namespace

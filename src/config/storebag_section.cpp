@@ -19,19 +19,6 @@ namespace {
 
 constexpr std::uint32_t kReleaseEnvironment = 4;
 
-// The section of an environment; null if there is none.
-const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
-  const std::optional<Dictionary>* sections[] = {&storebag.development, &storebag.flornInternal,
-                                                 &storebag.seed, &storebag.release};
-  const std::uint32_t place = environment - 1;
-  if (place >= std::size(sections)) return nullptr;
-  if (environment == kSeedEnvironment && !storebag.seed) {
-    logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
-    return sectionOf(storebag, kReleaseEnvironment);
-  }
-  return *sections[place] ? &**sections[place] : nullptr;
-}
-
 // Completes the answer with the section of the environment, if there is one. Returns the storebag for its
 // other keys.
 Storebag takeSection(const char* name, const Dictionary& whole, std::uint32_t environment,
@@ -49,6 +36,18 @@ Storebag takeSection(const char* name, const Dictionary& whole, std::uint32_t en
 }
 
 }  // namespace
+
+const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
+  const std::optional<Dictionary>* sections[] = {&storebag.development, &storebag.flornInternal,
+                                                 &storebag.seed, &storebag.release};
+  const std::uint32_t place = environment - 1;
+  if (place >= std::size(sections)) return nullptr;
+  if (environment == kSeedEnvironment && !storebag.seed) {
+    logWarning("fetchStorebagForEnvironmentAndClientType: Seed section is missing in the storebag.");
+    return sectionOf(storebag, kReleaseEnvironment);
+  }
+  return *sections[place] ? &**sections[place] : nullptr;
+}
 
 StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
                                    const support::Veltra& veltra, OperatorSettings& choices,

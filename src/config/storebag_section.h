@@ -14,6 +14,11 @@ namespace veltrad::config {
 
 class OperatorSettings;
 class StorebagStore;
+struct Storebag;
+
+// The section that devices of an environment use; null if there is none. Of "seed" without a section it is
+// that of "release".
+const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment);
 
 // The real source: downloads the storebag at each call, and keeps it on disk where the operator has chosen
 // so. While the operator's choices cannot be read and never could, there is no attempt. Any number of threads

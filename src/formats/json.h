@@ -25,9 +25,6 @@ struct JSONError {
 Result<Value, JSONError> parseJSON(std::string_view text);
 // The same where "// …" and "/* … */" may stand between the tokens.
 Result<Value, JSONError> parseJSONWithComments(std::string_view text);
-// Where in a text that parseJSONWithComments takes the key or the element of an array begins that `path`
-// leads to: keys, and numbers of elements from 0 in decimal. Nothing: it is not there.
-std::optional<std::size_t> offsetInJSON(std::string_view text, const std::vector<std::string>& path);
 
 enum class JSONStyle { compact, pretty };
 // The reverse of parseJSON. A real that is not finite becomes null, an invalid byte of a text U+FFFD.

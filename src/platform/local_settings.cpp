@@ -6,6 +6,7 @@
 
 #include "base/text.h"
 #include "formats/json.h"
+#include "formats/places.h"
 #include "formats/property_list.h"
 
 namespace veltrad::platform {
@@ -48,8 +49,11 @@ bool sayTheSame(const LocalContent& a, const LocalContent& b) {
 
 std::string LocalContent::placeOf(const std::vector<std::string>& keys) const {
   if (keys.empty()) return placeText(path, {});
-  const auto offset = path.ends_with(".json") ? formats::offsetInJSON(bytes, keys) : std::nullopt;
-  return offset ? placeText(path, placeInText(bytes, *offset)) : path;
+  if (bytes.starts_with("bplist")) return path;
+  const formats::Places places =
+      path.ends_with(".json") ? formats::placesInJSON(bytes) : formats::placesInXMLPropertyList(bytes);
+  const auto place = places.at(keys);
+  return place ? placeText(path, *place) : path;
 }
 
 LocalSettings::LocalSettings(FileStore& files, const std::string& path)

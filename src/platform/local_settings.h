@@ -25,7 +25,7 @@ struct LocalContent {
   std::optional<std::string> warning;  // both forms are there
 
   // "PATH:LINE:COLUMN" of a key, or of an element of an array by its number from 0; the path alone in a
-  // property list, whose values have no places. An empty `keys` is the outermost value.
+  // binary property list, whose values have no places. An empty `keys` is the outermost value.
   std::string placeOf(const std::vector<std::string>& keys) const;
 };
 

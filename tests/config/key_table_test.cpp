@@ -53,6 +53,7 @@ TYPED_TEST(KeyTable, ReadsEachKeyByItsType) {
   for (const config::Key& key : TypeParam::kKeys) {
     SCOPED_TRACE(key.name);
     EXPECT_TRUE(names.insert(key.name).second);
+    if (key.read == nullptr) continue;
     const auto read = [&key](Value value) { return config::parsed<TypeParam>({{key.name, value}}); };
     for (const Value& value : sampleOf(key.type).right) EXPECT_FALSE(read(value) == absent);
     for (const Value& value : sampleOf(key.type).wrong) EXPECT_TRUE(read(value) == absent);

@@ -47,7 +47,7 @@ TEST(ProcessSettings, StorebagServerComesFromThePreferenceOrTheDeployment) {
                 hosts("a/b"),
                 false,
                 publicURL,
-                ": publicStorebagHost is \"a/b\", expected a host name; using storebags.example"}};
+                ":6:2: publicStorebagHost is \"a/b\", expected a host name; using storebags.example"}};
   for (const auto& c : table) {
     const ExpectedLog log(c.warning.empty() ? Lines() : Lines{"4 storebagServerURL: " + path + c.warning});
     Machine machine(c.internal, c.preference);

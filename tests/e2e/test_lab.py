@@ -26,8 +26,11 @@ class LabAlone(unittest.TestCase):
             self.assertEqual(self.get(name)[0].status, 404, name)
         (self.lab.path / "storebags/broken.json").write_text('{"version": ')
         response, body = self.get("broken")
-        self.assertEqual((response.status, b"broken.json" in body), (500, True))
-        self.assertEqual([a["outcome"] for a in self.lab.received("storebags")], ["200", "404", "404", "404", "500"])
+        self.assertEqual((response.status, b"broken.json:1:13: " in body), (500, True))
+        (self.lab.path / "storebags/signed.json").write_text('{"bag": "", "signature": ""} // by whom?')
+        response, body = self.get("signed")
+        self.assertEqual((response.status, b"signed already" in body), (500, True))
+        self.assertEqual([a["outcome"] for a in self.lab.received("storebags")], ["200", "404", "404", "404", "500", "500"])
         for rule, word in (({"stats": 1}, "stats"), ({"status": "503"}, "status"), ({"times": 0}, "times")):
             response, body = self.lab.request("POST", "/control", json.dumps(rule))
             self.assertEqual(response.status, 400)

@@ -50,6 +50,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   BackendActivity activity() const override;
   std::vector<std::string> hosts() const override;
   bool hostsAreFixed() const override { return false; }
+  // How it stands, for tools. The session's thread.
+  const HTTPSPostState& clientState() const { return _clientState; }
 
  private:
   void dropWaiting() override;

@@ -13,8 +13,8 @@
 #include "base/text.h"
 #include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
-#include "tools/ctl/key_value.h"
 #include "tools/ctl/owner_options.h"
+#include "tools/key_value.h"
 #include "veltra/veltra.h"
 #include "wire/constants.h"
 
@@ -34,7 +34,7 @@ struct Texts {
 };
 
 std::string keyValueProblem(const std::string& text) {
-  const auto entry = parseKeyValue(text);
+  const auto entry = tools::parseKeyValue(text);
   return entry ? std::string() : entry.error();
 }
 
@@ -275,9 +275,9 @@ void offerPreferences(tools::CommandLine& line) {
 
 // The texts have been checked.
 void putTogether(const Texts& texts, Options& options) {
-  if (!texts.payload.empty()) options.payload = parseKeyValues(texts.payload).value();
+  if (!texts.payload.empty()) options.payload = tools::parseKeyValues(texts.payload).value();
   if (!texts.client && !texts.service && texts.userInfo.empty()) return;
-  Dictionary userInfo = parseKeyValues(texts.userInfo).value();
+  Dictionary userInfo = tools::parseKeyValues(texts.userInfo).value();
   userInfo.setIfPresent(wire::kVeltraUserInfoClientName, texts.client);
   userInfo.setIfPresent(wire::kVeltraUserInfoServiceName, texts.service);
   options.identity.userInfo = std::move(userInfo);

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 
+#include "base/text.h"
 #include "certificate.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
@@ -74,9 +75,11 @@ bool isStorebagName(const std::string& name) {
 
 Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   if (json) {
-    auto value = formats::parseJSON(bytes);
+    auto value = formats::parseJSONWithComments(bytes);
     if (value) return std::move(value).value();
-    return Failure{"no JSON at byte " + std::to_string(value.error().offset) + ": " + value.error().detail};
+    const TextPlace place = placeInText(bytes, value.error().offset);
+    return Failure{std::to_string(place.line) + ":" + std::to_string(place.column) +
+                   ": no JSON: " + value.error().detail};
   }
   auto value = formats::parsePropertyList(bytes);
   if (value) return std::move(value).value();
@@ -138,7 +141,11 @@ Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& nam
   const auto bytes = files.read(path, 16u << 20);
   if (!bytes) return Failure{StorebagFailure{Kind::unreadable, bytes.error().description}};
   const auto value = parsed(bytes.value(), json);
-  if (!value) return Failure{StorebagFailure{Kind::unreadable, path + ": " + value.error()}};
+  if (!value) return Failure{StorebagFailure{Kind::unreadable, path + (json ? ":" : ": ") + value.error()}};
+  if (const Dictionary* whole = value.value().asDictionary(); whole && whole->string("bag"))
+    return Failure{StorebagFailure{
+        Kind::unreadable, path + ": is signed already, and the lab signs what it serves: put the storebag "
+                                 "itself there (veltra-storebag show prints it)"}};
   const Value changed = withAddresses(value.value(), url, dashboardPort);
   if (!changed.asDictionary())
     return Failure{StorebagFailure{Kind::unreadable, path + ": a storebag is a dictionary at its top"}};

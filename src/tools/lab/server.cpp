@@ -169,6 +169,8 @@ void Server::Library::storebag(const httplib::Request& request, httplib::Respons
   const std::string name = request.path.substr(request.path.rfind('/') + 1);
   const auto rule = lab._misbehaviour.take(request.path);
   const auto file = lab._directory.storebag(name, lab._url, lab.dashboardPort());
+  if (!file && file.error().kind == StorebagFailure::Kind::unreadable)
+    std::fprintf(stderr, "veltra-lab: %s\n", file.error().description.c_str());
   Answer answer = file ? answerWithStorebag(file.value(), lab._directory.signingKey(),
                                             rule ? rule->sign : Rule::Signature::right, lab._maxAge,
                                             request.get_header_value("If-Modified-Since"))

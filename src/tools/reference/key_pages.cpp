@@ -9,6 +9,7 @@
 
 #include "config/client_types.h"
 #include "config/preference_keys.h"
+#include "storebag/findings.h"
 #include "tools/reference/markdown.h"
 #include "wire/reasons.h"
 
@@ -123,6 +124,14 @@ std::string environments() {
   std::string page = "| environment | section |\n|---|---|\n| 0 | none |\n";
   for (std::uint32_t number = 1; const char* name = config::sectionNameForEnvironment(number); ++number)
     page += fmt::format("| {} | {} |\n", number, escaped(name));
+  return page;
+}
+
+std::string findings() {
+  std::string page;
+  for (const storebag::FindingKind& kind : storebag::findingKinds())
+    page += fmt::format("- **{}** ({}): {} {}\n", kind.name, storebag::textOf(kind.severity),
+                        escaped(kind.meaning), escaped(kind.mend));
   return page;
 }
 

@@ -16,6 +16,8 @@ std::string preferences();
 std::string clientTypes();
 // A table of the environments: number and section.
 std::string environments();
+// What lint of veltra-storebag finds: name, severity, meaning, mend.
+std::string findings();
 // The texts that veltractl stats shows, with their names.
 std::string reasons();
 

@@ -42,6 +42,7 @@ constexpr Part kParts[] = {
     {"description of veltra-lab", [] { return prose(lab::commandLine().about); }},
     {"options of veltra-lab", [] { return optionsOf(lab::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
+    {"findings of lint", findings},
     {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},
     {"keys of the policy", [] { return keysOf(config::PolicyRules::kKeys, kNotYet); }},
     {"preferences", preferences},

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads, checks, signs and shows storebags.
+// Makes keys; signs, verifies and shows storebags.
 #include "storebag/commands.h"
 
 #include <fcntl.h>
@@ -45,58 +45,18 @@ std::optional<std::string> writeNew(const std::string& path, const std::string& 
   return path + ": could not be written";
 }
 
-// A file's content, and the bytes to sign for it.
-struct Bag {
-  Value content;
-  std::string bytes;
-};
-
-bool startsLikeJSON(std::string_view bytes) {
-  const std::size_t first = bytes.find_first_not_of(" \t\r\n");
-  return first != std::string_view::npos && (bytes[first] == '{' || bytes[first] == '[');
-}
-
-// Limits are those of the readers. sign() checks those of the daemon.
-Result<Bag, std::string> readBag(const std::string& path) {
-  platform::DiskFileStore files;
-  auto bytes = files.read(path, PropertyListLimits{}.bytes);
-  if (!bytes) return Failure{bytes.error().description};
-  if (startsLikeJSON(bytes.value())) {
-    auto json = formats::parseJSON(bytes.value());
-    if (!json)
-      return Failure{fmt::format("{}: JSON, byte {}: {}", path, json.error().offset, json.error().detail)};
-    std::string list = formats::writeXMLPropertyList(json.value());
-    return Bag{std::move(json).value(), std::move(list)};
+// Why lint refuses the storebag; empty if it does not.
+std::string errorsIn(const StorebagDocument& bag) {
+  std::string lines;
+  std::size_t count = 0;
+  for (const Finding& finding : lintStorebag(bag)) {
+    if (kindOf(finding.name).severity != Severity::error) continue;
+    lines += "\n" + lineOf(bag.document.file, finding);
+    ++count;
   }
-  auto list = formats::parsePropertyList(bytes.value());
-  if (!list) {
-    if (list.error().kind == PropertyListError::Kind::notAPropertyList)
-      return Failure{path + ": neither a property list nor JSON"};
-    return Failure{path + ": " + list.error().description()};
-  }
-  return Bag{std::move(list).value(), std::move(bytes).value()};
-}
-
-std::string bounds() {
-  return fmt::format("at most {} bytes, {} levels and {} values", config::kStorebagBagLimits.bytes,
-                     config::kStorebagBagLimits.depth, config::kStorebagBagLimits.objects);
-}
-
-// The storebag in a container, without verification, or a bare storebag.
-Result<Dictionary, std::string> readStorebag(const std::string& file) {
-  const auto bag = readBag(file);
-  if (!bag) return Failure{bag.error()};
-  const Dictionary* content = bag.value().content.asDictionary();
-  if (content == nullptr) return Failure{file + ": no dictionary at its top level"};
-  // A storebag has no text named "bag", so this is a container.
-  const std::string* text = content->string("bag");
-  if (text == nullptr) return *content;
-  const auto decoded = config::decodeStorebagContainer({std::string(), *text});
-  if (!decoded) return Failure{file + ": \"bag\" is no base64"};
-  const auto inner = config::parseStorebagBag(decoded->bag);
-  if (!inner)
-    return Failure{fmt::format("{}: the bag is no property list of a dictionary within {}", file, bounds())};
-  return *inner;
+  if (count == 0) return "";
+  return fmt::format("{}: {} {}; --force signs it all the same{}", bag.document.file, count,
+                     count == 1 ? "error" : "errors", lines);
 }
 
 }  // namespace
@@ -116,21 +76,29 @@ Outcome keygen(const std::string& directory, int bits) {
   return done(fmt::format("{}\n{}\n", privatePath, publicPath));
 }
 
-Outcome sign(const std::string& privateKey, const std::string& in, const std::string& out) {
-  const auto key = config::SigningKey::load(privateKey);
+Outcome sign(const SignRequest& request) {
+  const auto key = config::SigningKey::load(request.privateKey);
   if (!key) return refused(key.error());
-  const auto bag = readBag(in);
-  if (!bag) return refused(bag.error());
-  if (bag.value().content.asDictionary() == nullptr)
-    return refused(in + ": the storebag is no dictionary at its top level");
-  if (!config::parseStorebagBag(bag.value().bytes))
-    return refused(fmt::format("{}: beyond what the daemon takes of a storebag: {}", in, bounds()));
-  const std::string container = config::makeStorebagContainerAround(key.value(), bag.value().bytes);
+  const auto bag = readStorebag(request.in);
+  if (!bag) return refused(bag.error().line());
+  if (bag.value().signedContainer)
+    return refused(request.in + ": is signed already; \"veltra-storebag show\" prints the storebag in it");
+  if (!request.force) {
+    if (std::string errors = errorsIn(bag.value()); !errors.empty()) return refused(std::move(errors));
+  }
+  const Document& document = bag.value().document;
+  const std::string bytes = document.form == Document::Form::json
+                                ? formats::writeXMLPropertyList(document.content)
+                                : document.bytes;
+  if (!config::parseStorebagBag(bytes))
+    return refused(
+        fmt::format("{}: beyond what the daemon takes of a storebag: {}", request.in, boundsOfStorebags()));
+  const std::string container = config::makeStorebagContainerAround(key.value(), bytes);
   if (!config::parseStorebagContainer(container))
-    return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", in, container.size(),
-                               config::kStorebagMostContainerBytes));
+    return refused(fmt::format("{}: signed it has {} bytes; the daemon takes {}", request.in,
+                               container.size(), config::kStorebagMostContainerBytes));
   platform::DiskFileStore files;
-  if (const auto written = files.replace(out, container, 0644); !written)
+  if (const auto written = files.replace(request.out, container, 0644); !written)
     return refused(written.error().description);
   return done("");
 }
@@ -144,8 +112,8 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
     return refused(fmt::format("{}: expected an RSA public key in DER form of {} to {} bits", publicKey,
                                config::StorebagKey::kFewestModulusBits,
                                config::StorebagKey::kMostModulusBits));
-  const auto bytes = files.read(file, config::kStorebagMostContainerBytes);
-  if (!bytes) return refused(bytes.error().description);
+  const auto bytes = readBytes(file);
+  if (!bytes) return refused(bytes.error());
   const auto container = config::parseStorebagContainer(bytes.value());
   if (!container)
     return refused(file + ": the container is no property list: " + container.error().description());
@@ -160,26 +128,18 @@ Outcome verify(const std::string& publicKey, const std::string& file) {
   if (!key->verifies(decoded->bag, decoded->signature))
     return refused(file + ": the signature is not this key's over this bag");
   if (!config::parseStorebagBag(decoded->bag))
-    return refused(
-        fmt::format("{}: signed, but the bag is no property list of a dictionary within {}", file, bounds()));
+    return refused(fmt::format("{}: signed, but the bag is no property list of a dictionary within {}", file,
+                               boundsOfStorebags()));
   return done(file + ": the signature holds\n");
 }
 
 Outcome show(const std::string& file, bool compact) {
-  const auto storebag = readStorebag(file);
-  if (!storebag) return refused(storebag.error());
-  std::string json = formats::writeJSON(storebag.value(),
+  const auto bag = readStorebag(file);
+  if (!bag) return refused(bag.error().line());
+  std::string json = formats::writeJSON(bag.value().storebag,
                                         compact ? formats::JSONStyle::compact : formats::JSONStyle::pretty);
   if (!json.ends_with('\n')) json += '\n';
   return done(std::move(json));
-}
-
-Outcome lint(const std::string& file) {
-  const auto storebag = readStorebag(file);
-  if (!storebag) return refused(storebag.error());
-  std::string text;
-  for (const std::string& finding : lintStorebag(storebag.value())) text += finding + "\n";
-  return text.empty() ? done("nothing found\n") : Outcome{true, std::move(text), true};
 }
 
 }  // namespace veltrad::storebag

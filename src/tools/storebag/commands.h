@@ -2,12 +2,17 @@
 // The commands of veltra-storebag.
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
+#include <vector>
+
+#include "storebag/given.h"
 
 namespace veltrad::storebag {
 
-// The text is the output, or says why the command was refused. With `findings` it lists what is wrong with
-// the storebag.
+// The text is the output, or says why the command was refused. With `findings` the output shows something
+// that the caller asked to be told about: mistakes, or a file that would change.
 struct Outcome {
   bool done = false;
   std::string text;
@@ -15,19 +20,69 @@ struct Outcome {
 };
 
 // The files that keygen makes. The private key has mode 0600.
-inline constexpr const char* kPrivateKeyFile = "privateKey.pem";
+inline constexpr const char* kPrivateKeyFile = "private.pem";
 inline constexpr const char* kPublicKeyFile = "publicKey.der";
+
+// Files are named; "-" is standard input.
 
 // Makes the directory if it is missing. Does nothing if either file exists.
 Outcome keygen(const std::string& directory, int bits);
+
+struct SignRequest {
+  std::string privateKey, in, out;
+  // Signs what lint calls an error, too.
+  bool force = false;
+};
 // `in` is a property list, whose bytes are signed unchanged, or JSON, which is converted into an XML property
 // list. Refuses what the daemon would not accept.
-Outcome sign(const std::string& privateKey, const std::string& in, const std::string& out);
+Outcome sign(const SignRequest& request);
 // Refuses a container that the daemon would not accept, and says which step fails.
 Outcome verify(const std::string& publicKey, const std::string& file);
 // Prints the storebag of a container, without verification, or a bare storebag as JSON.
 Outcome show(const std::string& file, bool compact);
-// Lists the mistakes in the storebag of such a file, one per line, or says "nothing found".
-Outcome lint(const std::string& file);
+
+struct LintRequest {
+  std::vector<std::string> files;
+  // Names of findings that are left out.
+  std::vector<std::string> allowed;
+  // As in LintOptions.
+  bool lab = false;
+  bool json = false;
+};
+// Lists the findings in the storebags of such files, one per line, or says "nothing found".
+Outcome lint(const LintRequest& request);
+
+struct FormatRequest {
+  std::string file;
+  bool write = false;
+  // Says only whether the file would change.
+  bool check = false;
+};
+// Lays out a storebag that is written as JSON.
+Outcome format(const FormatRequest& request);
+// Prints the JSON Schema of storebags.
+Outcome schema();
+
+// What explain is given besides what `given` holds already. Its 13 fields are its options.
+struct ExplainRequest {
+  std::string file;
+  Given given;
+  std::vector<std::string> userInfo, draws, payload;
+  std::optional<std::string> device, policy, messages, payloadFile;
+  std::optional<std::uint16_t> category, type;
+  std::int32_t flag = 0;
+  bool json = false;
+};
+// Says what each back end does with the messages of such a session.
+Outcome explain(const ExplainRequest& request);
+
+struct TestRequest {
+  std::vector<std::string> suites;
+  // Where the results are written in the form of JUnit.
+  std::optional<std::string> junit;
+  bool json = false;
+};
+// Runs suites of cases.
+Outcome test(const TestRequest& request);
 
 }  // namespace veltrad::storebag

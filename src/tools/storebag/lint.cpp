@@ -1,15 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// Finds mistakes in a storebag. Like the daemon, it treats a value of the wrong type as absent.
+// Goes through a storebag by the tables that the daemon reads it with.
 #include "storebag/lint.h"
 
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <iterator>
+#include <set>
 
-#include "base/text.h"
 #include "config/storebag_content.h"
-#include "formats/json.h"
+#include "storebag/address_check.h"
+#include "storebag/entry_check.h"
+#include "storebag/spelling.h"
+#include "storebag/value_check.h"
+#include "wire/constants.h"
 
 namespace veltrad::storebag {
 namespace {
@@ -17,149 +20,222 @@ namespace {
 using config::Key;
 using config::KeyTable;
 using config::KeyType;
+using enum FindingName;
 
-constexpr const char* kNobody = "refuses every client that requires user info";
-
-// In the order of KeyType.
-constexpr const char* kTypeNames[] = {"a text",   "a text",        "a text",   "an array of texts",
-                                      "a number", "a number",      "anything", "a dictionary",
-                                      "an array", "true or false", "a text"};
-static_assert(std::size(kTypeNames) == static_cast<std::size_t>(KeyType::choice) + 1);
-
-bool holdsText(const Array& array) {
-  return std::any_of(array.begin(), array.end(), [](const Value& item) { return item.asString(); });
+std::vector<std::string> namesOf(const KeyTable& table) {
+  std::vector<std::string> names;
+  for (const Key& key : table) names.emplace_back(key.name);
+  return names;
 }
 
-bool outside(const config::Range& range, const Value& number) {
-  const double read = number.toDouble().value_or(0);
-  return range.least < range.most && (read < range.least || read > range.most);
+std::string listed(const std::vector<std::string>& names) {
+  std::string text;
+  for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
+  return text;
 }
 
-std::string quoted(const std::string& text) {
-  return formats::writeJSON(Value(text));
+FindingName unknownIn(const KeyTable& table, const Value* value) {
+  if (&table == &config::StorebagSection::kKeys) return unknown_backend;
+  const bool isSection = &table == &config::Storebag::kKeys && value != nullptr && value->asDictionary();
+  return isSection ? unknown_section : unknown_key;
+}
+
+const char* nounOf(FindingName unknown) {
+  return unknown == unknown_section ? "section" : unknown == unknown_backend ? "back end" : "key";
+}
+
+// The keys that a misnamed entry probably has.
+const KeyTable* likelyTable(FindingName unknown, const Dictionary& content) {
+  if (unknown == unknown_section) return &config::StorebagSection::kKeys;
+  if (unknown != unknown_backend) return nullptr;
+  if (content.contains("clients")) return &config::HTTPSPostProfile::kKeys;
+  return content.contains("ip") ? &config::DashboardProfile::kKeys : nullptr;
 }
 
 class Lint {
  public:
-  void checkStorebag(const Dictionary& storebag) {
-    check("storebag", "section or key", storebag, config::Storebag::kKeys);
-  }
-  std::vector<std::string> take() { return std::move(_findings); }
+  explicit Lint(const LintOptions& options) : _values(_sink, options.lab), _entries(_sink) {}
 
- private:
-  void say(const std::string& place, const std::string& what) { _findings.push_back(place + ": " + what); }
-
-  void check(const std::string& place, const char* what, const Dictionary& dictionary,
-             const KeyTable& table) {
-    for (const auto& [name, value] : dictionary) {
-      if (const Key* key = table.find(name))
-        checkValue(place, *key, value);
-      else
-        sayUnknown(place, what, name, table);
+  void checkDictionary(const Spot& at, const Dictionary& dictionary, const KeyTable& table) {
+    sayDuplicates(at);
+    // Keys that stand there under another name, or without a value.
+    std::set<std::string> misnamed;
+    for (const std::string& name : allNames(at, dictionary)) {
+      const Value* value = dictionary.find(name);
+      const Key* key = table.find(name);
+      if (key == nullptr) {
+        key = checkUnknown(at, name, value, table);
+        if (key) misnamed.insert(key->name);
+      } else if (value == nullptr) {
+        _sink.say(wrong_type, at.key(name), fmt::format("{} is null and counts as absent", quoted(name)),
+                  "Take the key out, or give it a value.");
+        misnamed.insert(name);
+      } else {
+        _values.check(at.key(name), *key, *value);
+      }
+      if (key && value) checkInside(at.key(name), *key, *value);
     }
     for (const Key& key : table)
-      if (key.need == config::Need::required) checkRequired(place, key, dictionary.find(key.name));
-    checkWhole(place, dictionary, table);
-    for (const Key& key : table) {
-      const Value* value = key.inner != nullptr ? dictionary.find(key.name) : nullptr;
-      if (value == nullptr) continue;
-      const bool isSection = &table == &config::Storebag::kKeys;
-      const std::string at = isSection ? key.name : place + "." + key.name;
-      if (const Dictionary* inner = value->asDictionary(); inner && key.type == KeyType::dictionary)
-        check(at, isSection ? "back end" : "key", *inner, *key.inner);
-      else if (const Array* elements = value->asArray(); elements && key.type == KeyType::dictionaries)
-        checkElements(at, *elements, *key.inner);
+      if (key.need == config::Need::required && !misnamed.contains(key.name))
+        checkRequired(at, key, dictionary.find(key.name));
+    checkWhole(at, dictionary, table, misnamed);
+  }
+
+  std::vector<Finding> take() { return _sink.take(); }
+  LintSink& sink() { return _sink; }
+
+ private:
+  // Those whose value is null, too.
+  static std::set<std::string> allNames(const Spot& at, const Dictionary& dictionary) {
+    std::set<std::string> names;
+    for (const auto& [name, value] : dictionary) names.insert(name);
+    if (at.inside)
+      for (const auto& member : at.inside->members) names.insert(member.key);
+    return names;
+  }
+
+  void sayDuplicates(const Spot& at) {
+    if (at.inside == nullptr) return;
+    std::map<std::string_view, TextPlace> seen;
+    for (const auto& member : at.inside->members) {
+      const auto [first, isNew] = seen.emplace(member.key, member.place);
+      if (isNew) continue;
+      Spot spot = at.key(member.key);
+      spot.place = member.place;
+      _sink.say(duplicate_key, spot,
+                fmt::format("{} stands in line {}, too, and the last one counts", quoted(member.key),
+                            first->second.line));
     }
   }
 
-  void sayUnknown(const std::string& place, const char* what, const std::string& name,
-                  const KeyTable& table) {
-    std::string expected;
-    for (const Key& key : table) expected += (expected.empty() ? "" : ", ") + std::string(key.name);
-    say(place, fmt::format("unknown {} {}: expected one of {}", what, quoted(name), expected));
+  // The key that was probably meant, or null.
+  const Key* checkUnknown(const Spot& at, const std::string& name, const Value* value,
+                          const KeyTable& table) {
+    const FindingName unknown = unknownIn(table, value);
+    const std::vector<std::string> known = namesOf(table);
+    const auto meant = closestName(name, known);
+    const Key* key = meant ? table.find(*meant) : nullptr;
+    _sink.say(
+        unknown, at.key(name),
+        meant ? fmt::format("unknown {} {}: did you mean {}?", nounOf(unknown), quoted(name), quoted(*meant))
+              : fmt::format("unknown {} {}", nounOf(unknown), quoted(name)),
+        meant ? fmt::format("Write {}.", quoted(*meant))
+              : fmt::format("Take it out, or use one of {}.", listed(known)));
+    const Dictionary* content = value ? value->asDictionary() : nullptr;
+    if (content == nullptr || (key && key->inner)) return key;
+    if (const KeyTable* likely = likelyTable(unknown, *content))
+      checkDictionary(at.key(name), *content, *likely);
+    return key && !key->inner ? nullptr : key;
   }
 
-  void checkValue(const std::string& place, const Key& key, const Value& value) {
-    const std::string name = quoted(key.name);
-    if (!config::fits(value, key.type))
-      return say(place, fmt::format("{} is not {}: counts as absent", name,
-                                    kTypeNames[static_cast<std::size_t>(key.type)]));
-    if (key.type == KeyType::texts) {
-      for (const Value& item : *value.asArray())
-        if (!item.asString())
-          say(place, fmt::format("{} holds {}, which is no text", name, formats::writeJSON(item)));
-    } else if (key.type == KeyType::url && !lowerCase(*value.asString()).starts_with("https://")) {
-      say(place, fmt::format("{} does not begin with https://: nothing is posted to {}", name,
-                             quoted(*value.asString())));
-    } else if ((key.type == KeyType::integer || key.type == KeyType::real) && outside(key.range, value)) {
-      say(place, fmt::format("{} is {}: expected {:.0f} to {:.0f}", name, formats::writeJSON(value),
-                             key.range.least, key.range.most));
-    }
+  void checkInside(const Spot& at, const Key& key, const Value& value) {
+    if (key.inner == nullptr) return;
+    if (const Dictionary* inner = value.asDictionary(); inner && key.type == KeyType::dictionary)
+      checkDictionary(at, *inner, *key.inner);
+    else if (const Array* elements = value.asArray(); elements && key.type == KeyType::dictionaries)
+      checkElements(at, *elements, *key.inner);
   }
 
-  void checkRequired(const std::string& place, const Key& key, const Value* value) {
-    const bool given = value != nullptr && config::fits(*value, key.type);
-    if (key.type == KeyType::texts) {  // required lists are of countries
-      if (!given || !holdsText(*value->asArray()))
-        say(place, fmt::format("no country in \"{}\": {}", key.name, key.byDefault));
-    } else if (!given) {
-      say(place, fmt::format("no \"{}\": {}", key.name, key.byDefault));
-    }
-  }
-
-  // Checks what depends on several keys.
-  void checkWhole(const std::string& place, const Dictionary& dictionary, const KeyTable& table) {
-    if (&table == &config::HTTPSPostProfile::kKeys) {
-      const Array* clients = dictionary.array("clients");
-      if (clients != nullptr && clients->empty())
-        say(place, fmt::format("\"clients\" is empty: {}, and has no URL for the others", kNobody));
-    } else if (&table == &config::ClientEntry::kKeys) {
-      const Array* countries = dictionary.array("per_country_sampling_thresholds");
-      if (!dictionary.real("sampling_threshold") && (countries == nullptr || countries->empty()))
-        say(place, fmt::format("no \"sampling_threshold\", not even for a country: {}", kNobody));
-    } else if (&table == &config::filterTag::kKeys) {
-      checkAction(place, dictionary.string("action"));
-    }
-  }
-
-  void checkAction(const std::string& place, const std::string* action) {
-    const auto isNamed = [action](const auto& known) { return *action == known.first; };
-    if (action == nullptr ||
-        std::any_of(std::begin(config::kFilterActions), std::end(config::kFilterActions), isNamed))
-      return;
-    say(place,
-        fmt::format("unknown \"action\" {}: the field is kept; expected remove or sha256", quoted(*action)));
-  }
-
-  void checkElements(const std::string& place, const Array& elements, const KeyTable& table) {
-    // The place of the first client entry that matches every client.
-    std::string everyones;
+  void checkElements(const Spot& at, const Array& elements, const KeyTable& table) {
     for (std::size_t i = 0; i < elements.size(); ++i) {
-      const std::string at = fmt::format("{}[{}]", place, i);
-      const Dictionary* element = elements[i].asDictionary();
-      if (element == nullptr) {
-        say(at, "is not a dictionary: passed over");
-        continue;
-      }
-      if (!everyones.empty())
-        say(at,
-            fmt::format("never used for a client that requires user info: {} matches everyone", everyones));
-      else if (&table == &config::ClientEntry::kKeys && !element->string("client") &&
-               !element->string("service"))
-        everyones = at;
-      check(at, "key", *element, table);
+      if (const Dictionary* element = elements[i].asDictionary())
+        checkDictionary(at.element(i), *element, table);
+      else
+        _values.sayNoDictionary(at.element(i), elements[i]);
+    }
+    if (&table == &config::ClientEntry::kKeys) _entries.checkEntries(at, elements);
+    if (&table == &config::filterTag::kKeys) _entries.checkFilters(at, elements);
+  }
+
+  void checkRequired(const Spot& at, const Key& key, const Value* value) {
+    if (value == nullptr)
+      return _sink.say(missing_key, at, fmt::format("no \"{}\": {}", key.name, key.byDefault),
+                       fmt::format("Add \"{}\": {}", key.name,
+                                   lowerCase(std::string(1, key.meaning[0])) + std::string(key.meaning + 1)));
+    const Array* list = key.type == KeyType::texts ? value->asArray() : nullptr;
+    if (list && list->empty())
+      _sink.say(missing_key, at.key(key.name),
+                fmt::format("no country in \"{}\": {}", key.name, key.byDefault),
+                "Name the countries: [\"US\"].");
+    const Array* entries = key.type == KeyType::dictionaries && key.inner == &config::ClientEntry::kKeys
+                               ? value->asArray()
+                               : nullptr;
+    if (entries && entries->empty())
+      _sink.say(
+          missing_key, at.key(key.name),
+          "no entry in \"clients\": refuses every client that requires user info, and has no address for "
+          "the others",
+          "Add an entry, or take the back end out.");
+  }
+
+  // What no key says alone.
+  void checkWhole(const Spot& at, const Dictionary& dictionary, const KeyTable& table,
+                  const std::set<std::string>& misnamed) {
+    if (&table == &config::ClientEntry::kKeys) {
+      const Array* countries = dictionary.array("per_country_sampling_thresholds");
+      const bool given = dictionary.contains("sampling_threshold") || (countries && !countries->empty()) ||
+                         misnamed.contains("sampling_threshold") ||
+                         misnamed.contains("per_country_sampling_thresholds");
+      if (!given)
+        _sink.say(
+            missing_key, at,
+            "no \"sampling_threshold\", not even for a country: refuses every client that requires user "
+            "info",
+            "Add \"sampling_threshold\": 1 for every device, 0.1 for every tenth.");
+      _entries.checkConsent(at, dictionary);
+    } else if (&table == &config::DashboardProfile::kKeys) {
+      checkDashboard(at, dictionary);
+    } else if (&table == &config::UploadProfile::kKeys) {
+      const std::string* address = dictionary.string("post_url");
+      if (address && address->find_first_of("?#") != std::string::npos)
+        _sink.say(bad_address, at.key("post_url"),
+                  fmt::format("\"post_url\" {} has a query, and the daemon adds its own", quoted(*address)),
+                  "Take out the ? or # and what follows.");
     }
   }
 
-  std::vector<std::string> _findings;
+  void checkDashboard(const Spot& at, const Dictionary& dashboard) {
+    if (const std::string* ip = dashboard.string("ip")) {
+      if (const auto fault = faultOfIPv4(*ip))
+        _sink.say(fault->name, at.key("ip"), fmt::format("\"ip\" {} {}", quoted(*ip), fault->what),
+                  fault->mend);
+    }
+    _sink.say(reports_without_consent, at,
+              "a dashboard gets every message in clear, without consent, sampling or filters");
+  }
+
+  LintSink _sink;
+  const ValueCheck _values;
+  const EntryCheck _entries;
 };
+
+void checkSignature(const StorebagDocument& bag, LintSink& sink) {
+  if (bag.moreSignatures) return;
+  const Spot top = Spot::top(bag.document.places);
+  for (const char* key : {"serial", "expires", "revoked"}) {
+    if (!bag.storebag.contains(key)) continue;
+    sink.say(
+        sha1_alone, top.key(key),
+        fmt::format("\"{}\" is worth what the signature is worth, and the given scheme rests on SHA-1", key));
+    return;
+  }
+}
 
 }  // namespace
 
-std::vector<std::string> lintStorebag(const Dictionary& storebag) {
-  Lint lint;
-  lint.checkStorebag(storebag);
-  return lint.take();
+std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions& options) {
+  Lint lint(options);
+  lint.checkDictionary(Spot::top(bag.document.places), bag.storebag, config::Storebag::kKeys);
+  checkSignature(bag, lint.sink());
+  std::vector<Finding> findings = lint.take();
+  std::stable_sort(findings.begin(), findings.end(), [](const Finding& a, const Finding& b) {
+    return std::pair(a.place.line, a.place.column) < std::pair(b.place.line, b.place.column);
+  });
+  return findings;
+}
+
+Finding findingOf(const DocumentFailure& failure) {
+  return {syntax, failure.place.value_or(TextPlace{}), "", failure.detail, failure.mend};
 }
 
 }  // namespace veltrad::storebag

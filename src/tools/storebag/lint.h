@@ -2,15 +2,21 @@
 // Finds mistakes in the content of a storebag.
 #pragma once
 
-#include <string>
 #include <vector>
 
-#include "base/value.h"
+#include "storebag/document.h"
+#include "storebag/findings.h"
 
 namespace veltrad::storebag {
 
-// Returns one line for each finding, which begins with the place ("release.httppost.clients[0]: …"), in the
-// order of the storebag's keys.
-std::vector<std::string> lintStorebag(const Dictionary& storebag);
+struct LintOptions {
+  // The placeholders of veltra-lab, "${url}" and "${dashboardPort}", stand for what the lab puts there.
+  bool lab = false;
+};
+
+// All findings, in the order of their places.
+std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions& options = {});
+// Of a file that is no storebag.
+Finding findingOf(const DocumentFailure& failure);
 
 }  // namespace veltrad::storebag

@@ -11,9 +11,14 @@
 namespace veltrad::storebag {
 
 struct Arguments {
-  std::string directory, key, in, out, file;
+  std::string directory, key, file;
   int bits = config::SigningKey::kFewestBits;
   bool json = false;
+  SignRequest sign;
+  LintRequest lint;
+  FormatRequest format;
+  ExplainRequest explain;
+  TestRequest test;
   // Of the command, which runs while the arguments are parsed.
   Outcome outcome;
 };

@@ -3,9 +3,9 @@
 #include <gtest/gtest.h>
 
 #include "formats/json.h"
-#include "tools/ctl/key_value.h"
+#include "tools/key_value.h"
 
-namespace veltrad::ctl {
+namespace veltrad::tools {
 namespace {
 
 TEST(KeyValue, numbersAndBooleansAreToldFromTexts) {
@@ -21,4 +21,4 @@ TEST(KeyValue, numbersAndBooleansAreToldFromTexts) {
 }
 
 }  // namespace
-}  // namespace veltrad::ctl
+}  // namespace veltrad::tools

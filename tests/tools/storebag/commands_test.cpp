@@ -45,7 +45,7 @@ class StorebagCommands : public testing::Test {
   TemporaryDirectory _directory;
 
  protected:
-  const std::string privateKey = path("keys/privateKey.pem"), publicKey = path("keys/publicKey.der");
+  const std::string privateKey = path("keys/private.pem"), publicKey = path("keys/publicKey.der");
 };
 
 TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
@@ -53,20 +53,26 @@ TEST_F(StorebagCommands, SignRefusesWhatTheDaemonWouldNotTake) {
   for (int i = 0; i < 40; ++i) deep = Dictionary{{"deeper", deep}};
   const std::pair<std::string, const char*> inputs[] = {
       {"[1,2]", "no dictionary"},
-      {"{\"a\":", "JSON, byte"},
+      {"{\"a\":", ":1:6: "},
       {formats::writeXMLPropertyList(Array{}), "no dictionary"},
       {formats::writeXMLPropertyList(deep), "beyond what the daemon takes"},
       {formats::writeXMLPropertyList(Dictionary{{"note", std::string(1'800'000, 'x')}}),
        "the daemon takes 2097152"},
   };
   for (const auto& [bytes, reason] : inputs) {
-    EXPECT_THAT(refusal(storebag::sign(privateKey, file("in", bytes), path("out"))), HasSubstr(reason));
+    EXPECT_THAT(refusal(storebag::sign({privateKey, file("in", bytes), path("out"), true})),
+                HasSubstr(reason));
     EXPECT_FALSE(std::filesystem::exists(path("out"))) << reason;
   }
   const std::string in = file("in", "{}");
-  EXPECT_THAT(refusal(storebag::sign(publicKey, in, path("out"))), HasSubstr("RSA private key in PEM"));
-  EXPECT_THAT(refusal(storebag::sign(privateKey, path("nowhere"), path("out"))), HasSubstr("nowhere"));
-  EXPECT_THAT(refusal(storebag::sign(privateKey, in, path("no/out"))), HasSubstr("no/out"));
+  EXPECT_THAT(refusal(storebag::sign({privateKey, in, path("out")})),
+              testing::AllOf(HasSubstr("in: 2 errors; --force"), HasSubstr("in:1:1: error: no \"release\"")));
+  EXPECT_TRUE(storebag::sign({privateKey, in, path("out"), true}).done);
+  EXPECT_THAT(refusal(storebag::sign({privateKey, path("out"), path("again")})), HasSubstr("signed already"));
+  std::filesystem::remove(path("out"));
+  EXPECT_THAT(refusal(storebag::sign({publicKey, in, path("out")})), HasSubstr("RSA private key in PEM"));
+  EXPECT_THAT(refusal(storebag::sign({privateKey, path("nowhere"), path("out")})), HasSubstr("nowhere"));
+  EXPECT_THAT(refusal(storebag::sign({privateKey, in, path("no/out"), true})), HasSubstr("no/out"));
 }
 
 TEST_F(StorebagCommands, VerifyNamesTheStepThatFails) {

@@ -1,13 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // Parses KEY=VALUE.
-#include "tools/ctl/key_value.h"
+#include "tools/key_value.h"
 
 #include <fmt/format.h>
 
 #include "base/text.h"
 #include "formats/json.h"
 
-namespace veltrad::ctl {
+namespace veltrad::tools {
 namespace {
 
 bool isDigit(char c) {
@@ -44,4 +44,4 @@ Result<Dictionary, std::string> parseKeyValues(const std::vector<std::string>& t
   return Dictionary::fromEntries(std::move(entries));
 }
 
-}  // namespace veltrad::ctl
+}  // namespace veltrad::tools

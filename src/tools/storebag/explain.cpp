@@ -1,0 +1,267 @@
+// SPDX-License-Identifier: Apache-2.0
+// Tells of each back end what a dry run shows.
+#include <algorithm>
+#include <cmath>
+#include <limits>
+
+#include "backends/dashboard/packet_text.h"
+#include "backends/dashboard/udp_socket.h"
+#include "backends/https/https_post_backend.h"
+#include "backends/https/text_lists.h"
+#include "config/client_types.h"
+#include "config/storebag_section.h"
+#include "platform/log.h"
+#include "storebag/dry_run.h"
+#include "storebag/explanation.h"
+#include "wire/constants.h"
+
+namespace veltrad::storebag {
+namespace {
+
+using backends::SharedProfile;
+using config::ClientEntry;
+using wire::Reason;
+
+constexpr std::uint32_t kReleaseEnvironment = 4;
+
+// Each run has its own.
+constexpr const char* kFactsOfARun[] = {"_startTS",   "_clientTS",       "eventTime",
+                                        "_sessionID", "_timezoneOffset", "_reportVers"};
+
+const Value kUnknown(std::numeric_limits<double>::quiet_NaN());
+
+bool isContainer(const Value& value) {
+  return value.asArray() || value.asDictionary() || value.asData();
+}
+
+// The same with texts in place of what JSON events cannot carry, so that filters show what they do to it.
+Given flattened(Given given) {
+  const auto flatten = [](Dictionary& dictionary) {
+    for (const auto& [key, value] : Dictionary(dictionary))
+      if (isContainer(value)) dictionary.set(key, "");
+  };
+  for (GivenMessage& message : given.messages)
+    if (message.payload) flatten(*message.payload);
+  if (given.userInfo) flatten(*given.userInfo);
+  return given;
+}
+
+SharedProfile withoutFilters(const config::HTTPSPostProfile& profile) {
+  config::HTTPSPostProfile bare = profile;
+  for (ClientEntry& entry : *bare.clients)
+    if (entry.filters) entry.filters = config::Filters{};
+  return std::make_shared<const config::Profile>(std::move(bare));
+}
+
+std::optional<std::string> nameIn(const Given& given, const char* key) {
+  const std::string* name = given.userInfo ? given.userInfo->string(key) : nullptr;
+  return name ? std::optional(*name) : std::nullopt;
+}
+
+// The entry that decides or, if the session requires no user info, gives the address; else the nearest.
+void matchEntry(const std::vector<ClientEntry>& clients, const Given& given, BackendExplanation& told) {
+  if (!given.requireUserInfo) {
+    const auto taken = std::find_if(clients.begin(), clients.end(),
+                                    [](const ClientEntry& entry) { return entry.postURL.has_value(); });
+    if (taken != clients.end()) told.entry = static_cast<std::size_t>(taken - clients.begin());
+    return;
+  }
+  if (!given.userInfo) return;
+  const auto client = nameIn(given, wire::kVeltraUserInfoClientName);
+  const auto service = nameIn(given, wire::kVeltraUserInfoServiceName);
+  for (std::size_t i = 0; i < clients.size(); ++i) {
+    NearestEntry candidate{i, {}};
+    if (!backends::matchExactStringWithList(clients[i].client, client, true))
+      candidate.differs.emplace_back("client");
+    if (!backends::matchStringWithList(clients[i].service, service, true))
+      candidate.differs.emplace_back("service");
+    if (candidate.differs.empty()) {
+      told.entry = i;
+      told.nearest.reset();
+      return;
+    }
+    if (!told.nearest || candidate.differs.size() < told.nearest->differs.size()) told.nearest = candidate;
+  }
+}
+
+double chanceOf(const BackendExplanation& told) {
+  switch (told.reason) {
+    case Reason::reports:
+    case Reason::held_by_sampling:
+    case Reason::sampled_out:
+      return std::clamp(told.threshold.value_or(0), 0.0, 1.0);
+    default:
+      return told.state == backends::kBackendReporting ? 1 : 0;
+  }
+}
+
+// What filters did: `plain` is the same message without them.
+void compareEvents(const Dictionary& filtered, const Dictionary& plain, const Dictionary& original,
+                   BackendExplanation& told) {
+  for (const auto& [key, value] : plain) {
+    const Value* left = filtered.find(key);
+    const Value* first = original.find(key);
+    if (left == nullptr || (!(*left == value) && first && isContainer(*first)))
+      told.removed.insert(key);
+    else if (!(*left == value))
+      told.hashed.insert(key);
+  }
+}
+
+// What the owner's policy did.
+void addEdits(const config::EditedFields& edits, BackendExplanation& told) {
+  told.removed.insert(edits.removed.begin(), edits.removed.end());
+  told.hashed.insert(edits.hashed.begin(), edits.hashed.end());
+}
+
+// Takes out of an event what another run would have different.
+void hideFactsOfARun(const DryRun& run, const Dictionary& plain, std::size_t message, Dictionary& event) {
+  for (const char* key : kFactsOfARun)
+    if (event.contains(key)) event.set(key, kUnknown);
+  const auto isKeyedDigest = [&](const std::string& key, const config::EditedFields& edits,
+                                 const Dictionary& after) {
+    const Value* given = after.find(key);
+    const Value* sent = plain.find(key);
+    return edits.hashed.contains(key) && given && sent && *given == *sent;
+  };
+  for (const auto& [key, value] : Dictionary(event)) {
+    if (isKeyedDigest(key, run.editsOf(message), run.payloadOf(message)) ||
+        (run.sentUserInfo() && isKeyedDigest(key, run.userInfoEdits(), *run.sentUserInfo())))
+      event.set(key, kUnknown);
+  }
+}
+
+void tellEvents(const DryRun& run, const Given& given, const std::string& name,
+                const config::HTTPSPostProfile& profile, BackendExplanation& told) {
+  if (run.events().empty()) return;
+  const Given flat = flattened(given);
+  DryRun filtered(flat, name, std::make_shared<const config::Profile>(profile));
+  DryRun plain(flat, name, withoutFilters(profile));
+  filtered.play();
+  plain.play();
+  for (const auto& [message, event] : run.events()) {
+    const auto withFilters = filtered.events().find(message);
+    const auto without = plain.events().find(message);
+    if (withFilters == filtered.events().end() || without == plain.events().end()) continue;
+    Dictionary original =
+        message > 0 ? given.messages[message - 1].payload.value_or(Dictionary()) : Dictionary();
+    if (given.userInfo) original.merge(*given.userInfo);
+    compareEvents(withFilters->second, without->second, original, told);
+    addEdits(run.editsOf(message), told);
+    told.events.push_back(event);
+    told.messageOfEvent.push_back(message);
+    hideFactsOfARun(run, without->second, message, told.events.back());
+  }
+  addEdits(run.userInfoEdits(), told);
+  for (const std::string& key : told.removed) told.hashed.erase(key);
+}
+
+void tellHTTPS(const DryRun& run, const Given& given, const config::HTTPSPostProfile& profile,
+               BackendExplanation& told) {
+  const auto& backend = static_cast<const backends::HTTPSPostBackend&>(*run.backend());
+  const backends::HTTPSPostState& state = backend.clientState();
+  matchEntry(*profile.clients, given, told);
+  told.threshold = backend.samplingThreshold();
+  told.hierarchy = backend.hierarchy();
+  told.batched = state.batchEvents(*backend.facts());
+  told.eventThreshold = state.eventThreshold();
+  told.url = state.links().postURL();
+  told.realtimeUrl = state.links().realtimePostURL();
+}
+
+BackendExplanation explainBackend(const Given& given, const std::string& name, const SharedProfile& profile) {
+  BackendExplanation told;
+  DryRun run(given, name, profile);
+  if (run.backend() == nullptr) {
+    told.reason = run.reasonAgainst();
+    told.fates.assign(given.messages.size(), {wire::Fate::dropped, std::nullopt});
+    return told;
+  }
+  const backends::StateVerdict verdict = run.backend()->stateVerdict();
+  told.state = verdict.state;
+  told.reason = verdict.reason;
+  const auto* https = profile ? std::get_if<config::HTTPSPostProfile>(profile.get()) : nullptr;
+  const auto* upload = profile ? std::get_if<config::UploadProfile>(profile.get()) : nullptr;
+  if (https) tellHTTPS(run, given, *https, told);
+  if (upload) told.url = upload->postURL;
+  told.chance = chanceOf(told);
+  if (name == wire::kVeltraBackendMivo) {
+    // Whether there is an adaptor is not the storebag's matter.
+    const bool delivers = told.state == backends::kBackendReporting;
+    told.fates.assign(given.messages.size(), {delivers ? wire::Fate::delivered : wire::Fate::dropped, {}});
+    return told;
+  }
+  run.play();
+  for (std::size_t i = 0; i < given.messages.size(); ++i) told.fates.push_back(run.fateOf(i + 1));
+  if (https) tellEvents(run, given, name, *https, told);
+  return told;
+}
+
+// Without a socket, which would need a network.
+BackendExplanation explainDashboard(const Given& given, const std::string& name,
+                                    const config::DashboardProfile* profile) {
+  BackendExplanation told;
+  const std::size_t count = given.messages.size();
+  told.fates.assign(count, {wire::Fate::dropped, std::nullopt});
+  DryWorld world(given, name);
+  const auto word = world.gate.word();
+  const bool hasServer = profile && profile->ip && profile->port;
+  told.reason = Reason::bad_address;
+  if (!word->policy->makes(name))
+    told.reason = Reason::policy_backends;
+  else if (hasServer && word->refusalFor(name, {*profile->ip}) == Reason::policy_hosts)
+    told.reason = Reason::policy_hosts;
+  if (told.reason != Reason::bad_address || !hasServer ||
+      !backends::parseIPv4Address(*profile->ip, *profile->port))
+    return told;
+  const auto refusal = word->refusalFor(name, {*profile->ip});
+  told.state = refusal ? backends::kBackendDisabled : backends::kBackendReporting;
+  told.reason = refusal.value_or(Reason::always);
+  told.chance = chanceOf(told);
+  told.url = "udp://" + *profile->ip + ":" + std::to_string(*profile->port);
+  if (refusal) return told;
+  told.fates.assign(count, {profile->reliable.on ? wire::Fate::waiting : wire::Fate::sent, told.url});
+  for (const GivenMessage& message : given.messages) {
+    Dictionary payload = message.payload.value_or(Dictionary());
+    config::EditedFields edits;
+    if (word->fields) word->fields->apply(payload, edits);
+    addEdits(edits, told);
+    char field[backends::PacketText::kSize];
+    backends::PacketText(field).append(payload);
+    told.texts.emplace_back(field);
+  }
+  return told;
+}
+
+// The lines of the daemon's log are not what was asked for.
+class Silence {
+ public:
+  Silence() {
+    platform::log::setSink([](platform::LogLevel, std::string_view) {});
+  }
+  ~Silence() { platform::log::setSink(nullptr); }
+};
+
+}  // namespace
+
+Explanation explain(const Dictionary& storebag, const Given& given) {
+  const Silence silence;
+  Explanation told;
+  const auto parsed = config::parsed<config::Storebag>(storebag);
+  if (const char* name = config::storebagNameForClientType(given.clientType)) told.storebag = name;
+  told.version = parsed.version;
+  const Dictionary* section = config::sectionOf(parsed, given.environment);
+  if (section == nullptr || !told.storebag) return told;
+  const bool isRelease = section == config::sectionOf(parsed, kReleaseEnvironment);
+  told.section = config::sectionNameForEnvironment(isRelease ? kReleaseEnvironment : given.environment);
+  const auto content = config::parseSection(*section);
+  for (const auto& [name, profile] : content->backends) {
+    told.backends[name] =
+        name == wire::kVeltraBackendDashboard
+            ? explainDashboard(given, name, std::get_if<config::DashboardProfile>(profile.get()))
+            : explainBackend(given, name, profile);
+  }
+  return told;
+}
+
+}  // namespace veltrad::storebag

@@ -1,0 +1,129 @@
+// SPDX-License-Identifier: Apache-2.0
+// Says an explanation as JSON and to people.
+#include <fmt/format.h>
+
+#include <limits>
+
+#include "formats/json.h"
+#include "storebag/explanation.h"
+#include "storebag/lint_sink.h"
+
+namespace veltrad::storebag {
+namespace {
+
+// JSON has null for it.
+Value unknown() {
+  return std::numeric_limits<double>::quiet_NaN();
+}
+
+template <typename T>
+Value orNull(const std::optional<T>& value) {
+  return value ? Value(*value) : unknown();
+}
+Value orNull(const std::optional<std::size_t>& value) {
+  return value ? Value(static_cast<std::uint64_t>(*value)) : unknown();
+}
+
+template <typename List>
+Array arrayOf(const List& items) {
+  Array array;
+  for (const auto& item : items) array.emplace_back(item);
+  return array;
+}
+
+Array fatesOf(const BackendExplanation& told) {
+  Array array;
+  for (const MessageFate& message : told.fates)
+    array.emplace_back(Dictionary{{"fate", wire::nameOf(message.fate)}, {"url", orNull(message.url)}});
+  return array;
+}
+
+std::string listedNames(const std::set<std::string>& names) {
+  std::string text;
+  for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
+  return text;
+}
+
+std::string headline(const std::string& name, const BackendExplanation& told) {
+  if (!told.state) return fmt::format("{}: is not made: {}", name, wire::causeOf(told.reason));
+  static constexpr const char* kStates[] = {"waits", "does not report", "reports", "holds its events"};
+  return fmt::format("{}: {} (state {}): {} ({})", name, kStates[*told.state], *told.state,
+                     wire::causeOf(told.reason), wire::entryOf(told.reason).name);
+}
+
+std::string entryLine(const BackendExplanation& told) {
+  if (told.entry) return fmt::format("  entry clients[{}]\n", *told.entry);
+  if (!told.nearest) return "";
+  std::string differs;
+  for (const std::string& key : told.nearest->differs) differs += (differs.empty() ? "" : " and ") + key;
+  return fmt::format("  no entry fits; the nearest is clients[{}], whose {} differs\n", told.nearest->entry,
+                     differs);
+}
+
+std::string backendText(const std::string& name, const BackendExplanation& told) {
+  std::string text = headline(name, told) + "\n" + entryLine(told);
+  if (!told.state) return text;
+  text += fmt::format("  {:.4g} % of devices report", told.chance * 100);
+  if (told.threshold) text += fmt::format(" (threshold {})", *told.threshold);
+  text += "\n";
+  if (told.url) text += fmt::format("  to {}\n", *told.url);
+  if (told.realtimeUrl && told.realtimeUrl != told.url)
+    text += fmt::format("  realtime events to {}\n", *told.realtimeUrl);
+  if (told.batched)
+    text +=
+        fmt::format("  in batches, flushed above {} events of a method\n", told.eventThreshold.value_or(0));
+  if (!told.removed.empty()) text += fmt::format("  removed: {}\n", listedNames(told.removed));
+  if (!told.hashed.empty()) text += fmt::format("  hashed: {}\n", listedNames(told.hashed));
+  for (std::size_t i = 0; i < told.fates.size(); ++i)
+    text += fmt::format("  message {}: {}{}\n", i + 1, wire::nameOf(told.fates[i].fate),
+                        i < told.texts.size() ? " \"" + told.texts[i] + "\"" : "");
+  for (const Dictionary& event : told.events)
+    text += fmt::format("  leaves: {}\n", formats::writeJSON(event));
+  return text;
+}
+
+}  // namespace
+
+Dictionary asDictionary(const BackendExplanation& told) {
+  Value nearest = unknown();
+  if (told.nearest)
+    nearest = Dictionary{{"entry", static_cast<std::uint64_t>(told.nearest->entry)},
+                         {"differs", arrayOf(told.nearest->differs)}};
+  return {{"state", orNull(told.state)},
+          {"reason", wire::entryOf(told.reason).name},
+          {"entry", orNull(told.entry)},
+          {"nearest", nearest},
+          {"threshold", orNull(told.threshold)},
+          {"chance", told.chance},
+          {"hierarchy", told.hierarchy},
+          {"batched", told.batched},
+          {"eventThreshold", orNull(told.eventThreshold)},
+          {"url", orNull(told.url)},
+          {"realtimeUrl", orNull(told.realtimeUrl)},
+          {"events", arrayOf(told.events)},
+          {"fates", fatesOf(told)},
+          {"removed", arrayOf(told.removed)},
+          {"hashed", arrayOf(told.hashed)},
+          {"texts", arrayOf(told.texts)}};
+}
+
+Dictionary asDictionary(const Explanation& explanation) {
+  Dictionary backends;
+  for (const auto& [name, told] : explanation.backends) backends.set(name, asDictionary(told));
+  return {{"storebag", orNull(explanation.storebag)},
+          {"version", orNull(explanation.version)},
+          {"section", orNull(explanation.section)},
+          {"backends", backends}};
+}
+
+std::string textOf(const Explanation& explanation) {
+  if (!explanation.storebag) return "Nothing is reported: this client type has no storebag.\n";
+  if (!explanation.section) return "Nothing is reported: the storebag has no section for this environment.\n";
+  std::string text = fmt::format("storebag {}, version {}, section {}\n", *explanation.storebag,
+                                 explanation.version.value_or("none"), *explanation.section);
+  if (explanation.backends.empty()) text += "Nothing is reported: the section has no back ends.\n";
+  for (const auto& [name, told] : explanation.backends) text += "\n" + backendText(name, told);
+  return text;
+}
+
+}  // namespace veltrad::storebag
