@@ -40,15 +40,20 @@ install(FILES packaging/veltrad.sysusers DESTINATION lib/sysusers.d RENAME veltr
 install(FILES packaging/veltrad.tmpfiles DESTINATION lib/tmpfiles.d RENAME veltrad.conf COMPONENT daemon)
 veltra_install_configuration(daemon ${PROJECT_SOURCE_DIR}/packaging/veltrad.logrotate logrotate.d veltrad)
 
-# ---- libveltra ----
+# ---- libveltra, libveltra-testing ----
 install(TARGETS veltra EXPORT Veltra
         LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT library NAMELINK_COMPONENT development
+        INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(TARGETS veltra-testing EXPORT Veltra
+        LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT development
         INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
 install(DIRECTORY include/veltra DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development)
 file(RELATIVE_PATH UP_TO_PREFIX ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_PREFIX})
 string(REGEX REPLACE "/$" "" UP_TO_PREFIX "${UP_TO_PREFIX}")
-configure_file(cmake/veltra.pc.in ${MADE}/veltra.pc @ONLY)
-install(FILES ${MADE}/veltra.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+foreach(name veltra veltra-testing)
+  configure_file(cmake/${name}.pc.in ${MADE}/${name}.pc @ONLY)
+  install(FILES ${MADE}/${name}.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+endforeach()
 configure_package_config_file(cmake/VeltraConfig.cmake.in ${MADE}/VeltraConfig.cmake
                               INSTALL_DESTINATION ${CONFIG_DIRECTORY} NO_SET_AND_CHECK_MACRO)
 write_basic_package_version_file(${MADE}/VeltraConfigVersion.cmake COMPATIBILITY SameMajorVersion)

@@ -39,6 +39,9 @@ class Connection {
   // Called once, when the connection has ended, before the session's end().
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   virtual void resume() = 0;
+  // Instead of resume(), in a delegate's call that returns true: tells the client why and ends the
+  // connection.
+  virtual void refuse(const std::string& description) = 0;
 
   // Sends a frame of client_events.h. Never blocks, and takes only leaf locks. Returns why the frame was
   // dropped, if it was.

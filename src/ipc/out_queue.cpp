@@ -38,7 +38,20 @@ OutQueue::OutQueue(FileDescriptor socket, platform::Counters& counters,
 }
 
 OutQueue::Sent OutQueue::sendReply(std::string_view frame) {
-  const Sent sent = put(frame, Kind::reply);
+  return counted(put(frame, Kind::reply));
+}
+
+OutQueue::Sent OutQueue::sendOutcomes(std::uint32_t callID, const wire::Outcomes& outcomes) {
+  Sent sent;
+  {
+    const Lock lock(_mutex);
+    sent = putLocked(_lastSent.of(callID, outcomes), Kind::reply);
+  }
+  return counted(sent);
+}
+
+// Counts what became of a reply.
+OutQueue::Sent OutQueue::counted(Sent sent) {
   if (sent == Sent::full) {
     _counters.count(wire::Reason::replies_unread);
     requestEnd();
@@ -61,10 +74,14 @@ OutQueue::Sent OutQueue::sendEvent(std::string_view frame) {
 }
 
 OutQueue::Sent OutQueue::put(std::string_view frame, Kind kind) {
+  const Lock lock(_mutex);
+  return putLocked(frame, kind);
+}
+
+OutQueue::Sent OutQueue::putLocked(std::string_view frame, Kind kind) {
   const std::size_t bound = kOutQueueBound + (kind == Kind::reply ? kReplyReserve : 0);
   if (frame.size() > wire::kFrameBodyLimit + wire::kFrameHeaderBytes) return Sent::tooLarge;
   const std::size_t whole = frame.size();
-  Lock lock(_mutex);
   if (_gone) return Sent::gone;
   if (_waiting.empty() && _held && charge(frame.size(), kind)) {
     // The connection's thread writes it soon.

@@ -4,12 +4,14 @@
 
 #include <atomic>
 #include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <string>
 #include <string_view>
 
 #include "base/file_descriptor.h"
 #include "base/mutex.h"
+#include "ipc/sent_frame.h"
 #include "platform/counters.h"
 #include "platform/memory_budget.h"
 
@@ -24,7 +26,7 @@ inline constexpr std::size_t kOutQueueHighWater = 256u << 10;
 
 // Takes frames from any thread, writes them in order without blocking, and limits the memory for a client
 // that does not read. Owns the socket and the wake-up descriptor. Shared by the connection and by everything
-// that may still answer, so it may outlive the connection; the counters must outlive it. Its 16 fields hold
+// that may still answer, so it may outlive the connection; the counters must outlive it. Its 17 fields hold
 // the descriptors twice: as owners under the lock, and as numbers for the connection's thread, which polls
 // without it.
 class OutQueue {
@@ -39,6 +41,8 @@ class OutQueue {
 
   // For replies, hellos and refusals, which may use the reserve. `full` also ends the connection.
   Sent sendReply(std::string_view frame);
+  // The same for the reply to a message, without a text. May throw std::bad_alloc.
+  Sent sendOutcomes(std::uint32_t callID, const wire::Outcomes& outcomes);
   Sent sendEvent(std::string_view frame);
   // For the last frame, which may use the reserve too. A client that has gone is not counted.
   void sendLast(std::string_view frame) { put(frame, Kind::reply); }
@@ -69,6 +73,8 @@ class OutQueue {
   enum class Kind { event, reply };
 
   Sent put(std::string_view frame, Kind kind);
+  Sent putLocked(std::string_view frame, Kind kind) REQUIRES(_mutex);
+  Sent counted(Sent sent);
   bool charge(std::size_t bytes, Kind kind) REQUIRES(_mutex);
   void payBack(std::size_t waiting) REQUIRES(_mutex);
   bool writeSome(std::string_view& bytes) REQUIRES(_mutex);
@@ -100,6 +106,7 @@ class OutQueue {
   platform::Charge _replies GUARDED_BY(_mutex);
   // Bytes of _waiting that were written.
   std::size_t _written GUARDED_BY(_mutex) = 0;
+  SentFrame _lastSent GUARDED_BY(_mutex);
 };
 
 // Closes a socket so that the peer can still read what was written to it.

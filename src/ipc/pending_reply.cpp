@@ -6,6 +6,7 @@
 
 #include <new>
 
+#include "ipc/sent_frame.h"
 #include "wire/frame.h"
 #include "wire/names.h"
 
@@ -27,6 +28,15 @@ void PendingReply::answer(Dictionary results) {
   Dictionary body;
   body.set(key::kResults, std::move(results));
   send(std::move(body));
+}
+
+void PendingReply::answerSent(const wire::Outcomes& outcomes) {
+  if (_answered.exchange(true, std::memory_order_acq_rel)) return;
+  try {
+    _out->sendOutcomes(_callID, outcomes);
+  } catch (const std::bad_alloc&) {
+    _out->requestEnd();
+  }
 }
 
 void PendingReply::fail(const wire::ReportingError& error) {
@@ -59,14 +69,6 @@ void setError(Dictionary& results, const std::optional<wire::ReportingError>& er
   if (error) results.set(key::kError, wire::dictionaryOfError(*error));
 }
 
-Dictionary dictionaryOf(const wire::Outcome& outcome) {
-  const wire::Reason reason = outcome.decision.reason;
-  return {{key::kBackend, outcome.backend},
-          {key::kOutcome, wire::nameOf(outcome.decision.fate)},
-          {key::kReason, wire::entryOf(reason).name},
-          {key::kText, wire::causeOf(reason)}};
-}
-
 }  // namespace
 
 wire::StringReply stringReply(std::shared_ptr<PendingReply> pending) {
@@ -81,11 +83,9 @@ wire::StringReply stringReply(std::shared_ptr<PendingReply> pending) {
 wire::SentReply sentReply(std::shared_ptr<PendingReply> pending) {
   if (!pending) return {};
   return [pending = std::move(pending)](std::optional<std::string> text, const wire::Outcomes& outcomes) {
-    Array encoded;
-    encoded.reserve(outcomes.size());
-    for (const wire::Outcome& outcome : outcomes) encoded.push_back(dictionaryOf(outcome));
-    Dictionary results{{key::kOutcomes, std::move(encoded)}};
-    if (text) results.set(key::kReply, std::move(*text));
+    if (!text) return pending->answerSent(outcomes);
+    Dictionary results = SentFrame::resultsOf(outcomes);
+    results.set(key::kReply, std::move(*text));
     pending->answer(std::move(results));
   };
 }

@@ -19,8 +19,10 @@ class PendingReply {
   PendingReply(std::shared_ptr<OutQueue> out, std::uint32_t callID) : _out(std::move(out)), _callID(callID) {}
   ~PendingReply();
 
-  // Only the first call of either function counts.
+  // Only the first call of any of these functions counts.
   void answer(Dictionary results);
+  // To a message, without a text.
+  void answerSent(const wire::Outcomes& outcomes);
   void fail(const wire::ReportingError& error);
 
  private:

@@ -261,11 +261,9 @@ void SocketConnection::end() {
   if (const auto handler = std::exchange(_invalidationHandler, nullptr)) handler();
   _interruptionHandler = nullptr;
   _observer.reset();
-  if (const auto session = std::exchange(_session, nullptr)) {
-    // Before the session's end, so that the client knows what the end of its copies means.
-    if (_greeted && _stopping.load(std::memory_order_acquire)) sendGoodbye(*_out, _calls);
-    session->end();
-  }
+  // Before the session's end, so that the client knows what the end of its copies means.
+  if (_greeted && _stopping.load(std::memory_order_acquire)) sendGoodbye(*_out, _calls);
+  if (const auto session = std::exchange(_session, nullptr)) session->end();
   writeRest();
   _out->close();
 }

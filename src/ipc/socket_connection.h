@@ -36,11 +36,11 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   bool usable() const { return _out->usable(); }
   const Peer& peer() const { return _peer; }
 
-  // To be called once after the delegate has accepted: serves the client until the connection ends, then
+  // To be called once after the delegate has returned true: serves the client until the connection ends, then
   // calls the invalidation handler and the session's end(), and closes the socket.
   void run();
-  // To be called instead if the delegate has refused: tells the client why and closes the socket.
-  void refuse(const std::string& description);
+  // Tells the client why and closes the socket.
+  void refuse(const std::string& description) override;
   // Reads nothing more. Frames that have arrived completely are run until `deadline`; then the client gets
   // the event "goodbye", and the connection ends.
   void stop(std::chrono::steady_clock::time_point deadline);

@@ -31,11 +31,15 @@ constexpr std::string_view nameOf(Fate fate) {
 struct Decision {
   Fate fate = Fate::none;
   Reason reason = Reason::takes_no_messages;
+
+  bool operator==(const Decision&) const = default;
 };
 
 struct Outcome {
   std::string backend;
   Decision decision;
+
+  bool operator==(const Outcome&) const = default;
 };
 using Outcomes = std::vector<Outcome>;
 

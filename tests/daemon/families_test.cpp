@@ -31,6 +31,7 @@ struct Client final : ipc::Connection {
   void setInterruptionHandler(std::function<void()>) override {}
   void setInvalidationHandler(std::function<void()>) override {}
   void resume() override {}
+  void refuse(const std::string&) override {}
   std::optional<std::string> sendEvent(std::string_view frame) override {
     std::this_thread::yield();  // others come to wait meanwhile
     add(frame == "copy" ? "copy" : "end");

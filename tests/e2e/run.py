@@ -23,8 +23,10 @@ def leaves(suite):
 
 def run_here(names):
     result = unittest.TextTestRunner(verbosity=2).run(unittest.defaultTestLoader.loadTestsFromNames(names))
+    for test, why in result.skipped:
+        print(f"SKIPPED {test.id()}: {why}")
     failed = {getattr(test, "test_case", test).id() for test, _ in result.failures + result.errors}  # a subtest's test
-    print(f"RESULT {result.testsRun - len(failed)} {len(failed)}")
+    print(f"RESULT {result.testsRun - len(failed) - len(result.skipped)} {len(failed)}")
 
 
 def run_apart(names):
@@ -51,8 +53,8 @@ def main(names):
             name, passed, failed, seconds, output = done.result()
             total_passed, total_failed = total_passed + passed, total_failed + failed
             print(f"{name}: {passed} passed, {failed} failed, {seconds:.1f} s", flush=True)
-            if failed:
-                print(output, flush=True)
+            skipped = [line for line in output.split("\n") if line.startswith("SKIPPED ")]
+            print(output if failed else "\n".join(skipped), end="\n" if failed or skipped else "", flush=True)
     print(f"{total_passed} passed, {total_failed} failed")
     return 1 if total_failed or not total_passed else 0
 

@@ -7,16 +7,19 @@ import os
 import signal
 import socket
 import subprocess
+import sys
 
-from harness import Process, SystemTest, activated, program, storebag
+from harness import SOURCE, Process, SystemTest, activated, program, storebag
 
 
 class Sender(Process):
-    """tests/e2e/clients/sender.cpp"""
+    """A program of tests/e2e/clients."""
+    programs = {"C++": [program("sender")], "C": [program("sender_c")],
+                "Python": [sys.executable, str(SOURCE / "tests/e2e/clients/sender.py")]}
 
-    def __init__(self, root, name, microseconds, kind):
+    def __init__(self, root, name, microseconds, kind, language="C++"):
         self.name = name
-        super().__init__([program("sender"), name, str(microseconds), kind], root.environment(), "stdout",
+        super().__init__([*self.programs[language], name, str(microseconds), kind], root.environment(), "stdout",
                          stdin=subprocess.PIPE)
         self.wait_for(lambda lines: lines, "the sender's first messages")
 
@@ -64,8 +67,8 @@ class Comeback(SystemTest):
     def daemon(self):
         return super().daemon(env={"VELTRA_LOG": "info"}, **self.handed)
 
-    def sender(self, name, microseconds=8000, kind="post"):
-        sender = Sender(self.root, name, microseconds, kind)
+    def sender(self, name, microseconds=8000, kind="post", language="C++"):
+        sender = Sender(self.root, name, microseconds, kind, language)
         self.addCleanup(sender.kill)
         return sender
 
@@ -102,7 +105,7 @@ class Comeback(SystemTest):
     def test_orderly_restarts_lose_nothing_in_silence(self):
         senders = [self.sender("early")]  # before there is a daemon
         self.running = self.daemon()
-        senders += [self.sender("post"), self.sender("reply", kind="reply")]
+        senders += [self.sender("post"), self.sender("reply", kind="reply"), self.sender("python", language="Python")]
         for _ in range(4):
             self.restart(senders, self.stop)
         said = [sender.finish() for sender in senders]
@@ -130,7 +133,8 @@ class Comeback(SystemTest):
 
     def test_what_a_killed_daemon_had_is_counted(self):
         self.running = self.daemon()
-        senders = [self.sender("post"), self.sender("reply", kind="reply")]
+        senders = [self.sender("post"), self.sender("python", kind="reply", language="Python")]
+        senders += [self.sender("reply", kind="reply")]
         for _ in range(3):
             self.restart(senders, lambda daemon: daemon.kill())
         said = [sender.finish() for sender in senders]
@@ -144,7 +148,8 @@ class Comeback(SystemTest):
         running.popen.send_signal(signal.SIGSTOP)
         late = self.sender("late", 0)  # is created while nobody answers
         idle = self.sender("idle", 1000)
-        said = [late.finish(), idle.finish()]
+        python = self.sender("python", 1000, language="Python")
+        said = [late.finish(), idle.finish(), python.finish()]
         running.popen.send_signal(signal.SIGCONT)
         said.append(sender.finish())
         self.stop(running)

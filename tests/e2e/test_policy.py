@@ -165,7 +165,8 @@ class Policy(PolicyTest):
 
     def test_a_withdrawal_under_load_stops_the_last_packet_within_a_second(self):
         self.say(consent="always")
-        with self.serving():
+        # A post that had not begun when the consent was withdrawn.
+        with self.serving("The owner of the device does not let it leave (policy_consent)"):
             clients = [self.client(batchEvent=batched) for batched in (False, False, True)]
             stop = threading.Event()
 

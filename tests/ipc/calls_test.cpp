@@ -56,6 +56,10 @@ TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
       return copy("second", {});
     }
     if (category == 3) return reply(std::string(1'200'000, 'x'), {});
+    if (category > 4) {
+      const auto fate = category == 5 ? wire::Fate::batched : wire::Fate::held;
+      return reply(std::nullopt, {{"httppost", {fate, wire::Reason::reports}}});
+    }
     held.push_back(std::move(reply));
     if (held.size() == 3) door.journal.add("held");
   };
@@ -80,6 +84,14 @@ TEST(Replies, CountOnceComeInAnyOrderAndAreNeverOwedForGood) {
   const Received last = client.next();
   EXPECT_EQ(last.callID, 4u);
   EXPECT_EQ(last.results(), R"({"outcomes":[],"reply":"late"})");
+  // Equal ones after each other, others between them.
+  client.send(messageFrame(6, 5) + messageFrame(7, 5) + messageFrame(8, 6) + messageFrame(9, 5));
+  for (const auto& [callID, fate] :
+       {std::pair{6u, "batched"}, {7u, "batched"}, {8u, "held"}, {9u, "batched"}}) {
+    const Received next = client.next();
+    EXPECT_EQ(next.callID, callID);
+    EXPECT_THAT(next.results(), HasSubstr(std::string(R"("outcome":")") + fate));
+  }
 }
 
 }  // namespace

@@ -165,6 +165,9 @@ with veltra.Session(client_type=7, client_name="phone", service_name="snake", re
     assert session.start() == ["httppost"]
     assert session.send(5, 77)'""")
         self.received('"_status":77')
+        self.box.run("""python3 /usr/share/doc/python3-veltra/examples/phone_test.py
+echo '#include <veltra/testing.h>
+int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c - $(pkg-config --libs veltra-testing) && ./a.out""")
         log = self.box.run("stat -c '%a %U:%G' /var/mobile/Library/Logs/Zentrel/Retired/*").strip()
         assert log == "640 veltrad:veltrad", log
         self.box.run("veltra-storebag keygen keys; logrotate --debug /etc/logrotate.d/veltrad")

@@ -24,6 +24,7 @@ struct Client final : ipc::Connection {
   void setInterruptionHandler(std::function<void()>) override {}
   void setInvalidationHandler(std::function<void()>) override {}
   void resume() override {}
+  void refuse(const std::string&) override {}
   std::optional<std::string> sendEvent(std::string_view) override { return std::nullopt; }
 };
 

@@ -20,14 +20,17 @@ std::string writeLocalLog(const tagReportingPacket& packet) {
   const char* code = config::senderCodeForComponentType(header.componentType);
   const auto clientVersion = static_cast<std::uint16_t>(~be16toh(header.invertedClientVersion));
 
-  char line[1152];
-  const int length =
-      std::snprintf(line, sizeof line, "%u.%03d %s 127.0.0.1 %s %5u %5u %5u %5u %5u %s",
-                    be32toh(header.seconds), header.timeFraction * 4, device, code ? code : "(null)",
-                    clientVersion, ~be32toh(header.invertedSessionID), be16toh(header.eventID),
-                    be16toh(header.method), be16toh(header.respCode), packet.text);
-  const auto written = std::min(static_cast<std::size_t>(std::max(length, 0)), sizeof line - 1);
-  return std::string(withoutIncompleteEnd({line, written}));
+  constexpr std::size_t kMost = 1151;
+  char head[160];
+  const int length = std::snprintf(head, sizeof head, "%u.%03d %s 127.0.0.1 %s %5u %5u %5u %5u %5u ",
+                                   be32toh(header.seconds), header.timeFraction * 4, device,
+                                   code ? code : "(null)", clientVersion, ~be32toh(header.invertedSessionID),
+                                   be16toh(header.eventID), be16toh(header.method), be16toh(header.respCode));
+  // Appended, because snprintf() copies a text character by character.
+  std::string line(head, std::min(static_cast<std::size_t>(std::max(length, 0)), sizeof head - 1));
+  line.append(packet.text, std::min(std::strlen(packet.text), kMost - line.size()));
+  line.resize(withoutIncompleteEnd(line).size());
+  return line;
 }
 
 }  // namespace veltrad::backends

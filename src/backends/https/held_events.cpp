@@ -21,19 +21,25 @@ HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,
   return _batch.full(size) ? Need::bound : Need::room;
 }
 
-void HeldEvents::add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
-                     std::uint64_t turn, std::uint64_t sessionIDChanges) {
+void HeldEvents::add(std::int32_t method, EventBatch::Event event, platform::Charge charge,
+                     std::uint64_t sessionIDChanges) {
   std::size_t dropped = 0;
+  std::size_t overShare = 0;
   {
     const Lock held(_mutex);
-    for (; _batch.size() > 0 && _batch.full(size); ++dropped) _batch.dropOldest();
+    for (; _batch.size() > 0 && _batch.full(event.size); ++dropped) _batch.dropOldest();
     _charge.add(std::move(charge));
     const bool changed = sessionIDChanges != _sessionIDChanges.load(std::memory_order_relaxed);
-    if (changed) event.set("_sessionID", _sessionID);
-    _batch.add(method, std::move(event), size, turn);
-    if (dropped > 0) settle();
+    if (changed) {
+      changeEvent(event.text,
+                  [this](Dictionary& fields) REQUIRES(_mutex) { fields.set("_sessionID", _sessionID); });
+      event.size = sizeOfEvent(event.text);
+    }
+    _batch.add(method, std::move(event));
+    if (dropped > 0 || changed) overShare = settle();
   }
   _counters.count(wire::Reason::batch_full, dropped);
+  _counters.count(wire::Reason::event_over_share, overShare);
 }
 
 void HeldEvents::restartCount(std::int32_t method) {
@@ -53,10 +59,14 @@ void HeldEvents::setSessionID(const std::string& sessionID) {
   _counters.count(wire::Reason::event_over_share, dropped);
 }
 
+void HeldEvents::unsettle() {
+  const Lock held(_mutex);
+  _batch.unsettle();
+}
+
 HeldEvents::Taken HeldEvents::take() {
   const Lock held(_mutex);
-  const std::size_t jsonBytes = _batch.jsonBytes();
-  return {_batch.take(), std::move(_charge), jsonBytes};
+  return {_batch.take(), std::move(_charge)};
 }
 
 std::size_t HeldEvents::discard() {

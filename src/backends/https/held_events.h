@@ -5,9 +5,9 @@
 
 #include <atomic>
 #include <cstdint>
+#include <deque>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "backends/https/event_batch.h"
 #include "backends/lock_ranks.h"
@@ -22,10 +22,8 @@ class HeldEvents final : public platform::Evictable {
  public:
   // The charge pays for the events and for what a flush makes of them.
   struct Taken {
-    std::vector<Dictionary> events;
+    std::deque<EventBatch::Event> events;
     platform::Charge charge;
-    // An upper bound on the events' JSON texts.
-    std::size_t jsonBytes = 0;
   };
   // Before the next event: there is room, its method's threshold requires a flush, or the batch is full.
   enum class Need { room, flush, bound };
@@ -40,10 +38,11 @@ class HeldEvents final : public platform::Evictable {
   // How often the session ID has changed. If the count is older, add() sets the current ID in the event.
   std::uint64_t sessionIDChanges() const { return _sessionIDChanges.load(std::memory_order_acquire); }
   // Drops the oldest events if the batch is full. `charge` pays for the event.
-  void add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
-           std::uint64_t turn, std::uint64_t sessionIDChanges);
+  void add(std::int32_t method, EventBatch::Event event, platform::Charge charge,
+           std::uint64_t sessionIDChanges);
   void restartCount(std::int32_t method);
   void setSessionID(const std::string& sessionID);
+  void unsettle();
   Taken take();
   // Returns the number of events dropped.
   std::size_t discard();

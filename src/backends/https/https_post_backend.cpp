@@ -2,10 +2,11 @@
 // Posts or batches messages, and flushes batches.
 #include "backends/https/https_post_backend.h"
 
+#include <algorithm>
 #include <utility>
 
-#include "backends/https/event.h"
 #include "backends/https/event_posts.h"
+#include "backends/https/json_fields.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
@@ -99,11 +100,8 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
-  Dictionary event = createEventDictfromPayload(*facts, productFamily(), message, _locale.timeZoneOffset());
-  if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
-  config::EditedFields edits;
-  filterEvent(event, edits);
-  addOwnersEdits(*facts, message.note, edits);
+  WrittenEvent event = writeEvent(*facts, message);
+  addOwnersEdits(*facts, message.note, event.edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -114,9 +112,28 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   const bool userInfoMissing = facts->requireUserInfo && !facts->userInfo;
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batching) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batching, facts->requireUserInfo);
-    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges, edits);
+    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges);
   }
-  return postEvent(std::move(event), *facts, message, edits);
+  return postEvent(std::move(event), *facts, message);
+}
+
+WrittenEvent HTTPSPostBackend::writeEvent(const SessionFacts& facts, const NumberedMessage& message) {
+  constexpr std::size_t kMoreOrLess = 64, kLongest = 8192;
+  noteUserInfo(facts);
+  WrittenEvent event = backends::writeEvent(facts, productFamily(), message, _locale.timeZoneOffset(),
+                                            _clientState.filters(), _lastLength + kMoreOrLess);
+  _lastLength = std::min(event.text.json.size(), kLongest);
+  count(event.filtered);
+  _counters.count(wire::Reason::field_not_json, event.notJSON);
+  return event;
+}
+
+// Events that were written with other user info or filters get the present ones when they are flushed.
+void HTTPSPostBackend::noteUserInfo(const SessionFacts& facts) {
+  if (facts.sentUserInfo == _writtenInfo && _clientState.filters() == _writtenFilters) return;
+  _held->unsettle();
+  _writtenInfo = facts.sentUserInfo;
+  _writtenFilters = _clientState.filters();
 }
 
 bool HTTPSPostBackend::recorded() const {
@@ -134,8 +151,8 @@ Dictionary HTTPSPostBackend::about(const SessionFacts& facts, const config::Edit
   return recorded() ? aboutDeparture(name(), facts, _clientState.entry(), edits) : Dictionary();
 }
 
-Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message,
-                                 const config::EditedFields& edits) {
+Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
+                                 const NumberedMessage& message) {
   const bool realtime = meansRealtime(message.flag);
   std::optional<std::string> flushed;
   if (realtime && !_held->empty()) {
@@ -147,16 +164,15 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts, co
   }
   logDebug("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), _clientState.batchEvents(facts),
            facts.requireUserInfo);
-  _posts.restrict(event);
   std::optional<platform::Charge> charge{std::in_place};
-  const EventSize size = sizeOfEvent(event);
+  const EventSize size = sizeOfEvent(event.text);
   if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
   if (!charge) {
     return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
   }
-  std::vector<Dictionary> events;
-  events.push_back(std::move(event));
-  JSONMessage posted = createMessage(std::move(events), facts, size.json);
+  std::vector<std::string> events;
+  events.push_back(std::move(event.text.json));
+  JSONMessage posted = createMessage(std::move(events), facts);
   std::optional<std::string> result = std::move(posted.pretty);
   if (flushed) {
     result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + result.value_or("(null)");
@@ -165,8 +181,8 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts, co
   const wire::Reason why = stateVerdict().reason;  // before an answer can change it
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
-                             {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr, about(facts, edits)});
+                             {std::move(posted.text), EventMap{message.method, message.respCode}, 1,
+                              std::move(*charge), 0, nullptr, about(facts, event.edits)});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -181,20 +197,16 @@ void HTTPSPostBackend::addStopFields(Dictionary& payload, bool batching) const {
   payload.merge(fields);
 }
 
-void HTTPSPostBackend::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
-  const FilterTable::Outcome outcome = _clientState.filters().filterEvent(event, changes);
+void HTTPSPostBackend::count(const FilterTable::Outcome& outcome) const {
   if (outcome.removed > 0) _counters.count(wire::Reason::field_removed, outcome.removed);
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
-Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
-                                  std::uint64_t sessionIDChanges, const config::EditedFields& edits) {
-  // User info and filters may have changed the event's method.
-  const std::int32_t method = event.int32("_method").value_or(0);
-  // Removes these fields now, so that they take no memory until the flush.
-  _posts.restrict(event);
+Sent HTTPSPostBackend::batchEvent(WrittenEvent event, platform::MemoryAccount* account,
+                                  std::uint64_t sessionIDChanges) {
+  const std::int32_t method = event.method;
   std::optional<std::string> flushed;
-  const EventSize size = sizeOfEvent(event);
+  const EventSize size = sizeOfEvent(event.text);
   const HeldEvents::Need need = _held->needOf(method, _clientState.eventThreshold(), size);
   if (need == HeldEvents::Need::flush) {
     logDebug(
@@ -208,9 +220,11 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* acc
   }
   if (recorded()) {
     if (_held->empty()) _batchEdits = {};
-    _batchEdits.add(edits);
+    _batchEdits.add(event.edits);
   }
-  const wire::Reason kept = keep(std::move(event), size, method, account, sessionIDChanges);
+  const wire::Reason kept =
+      keep(method, {std::move(event.text), size, account ? account->nextTurn() : 0, event.settled}, account,
+           sessionIDChanges);
   _counters.count(kept);
   if (kept != wire::Reason::event_batched) return {{wire::Fate::dropped, kept}, std::move(flushed)};
   const StateVerdict verdict = stateVerdict();
@@ -219,13 +233,12 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* acc
 }
 
 // Drops events of the user's other batches if necessary.
-wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
+wire::Reason HTTPSPostBackend::keep(std::int32_t method, EventBatch::Event event,
                                     platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
-  auto charge = account ? account->keep(size.charged) : platform::Charge();
+  auto charge = account ? account->keep(event.size.charged) : platform::Charge();
   if (!charge) return wire::Reason::event_over_share;
   if (account && !std::exchange(_evictable, true)) account->add(_held);
-  _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
-             sessionIDChanges);
+  _held->add(method, std::move(event), std::move(*charge), sessionIDChanges);
   return wire::Reason::event_batched;
 }
 
@@ -244,27 +257,18 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     return std::nullopt;
   }
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
+  noteUserInfo(*facts);
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
   config::EditedFields edits = std::exchange(_batchEdits, {});
-  if (const SharedDictionary& sent = facts->sentUserInfo) {
-    Dictionary filtered = *sent;
-    filterEvent(filtered, edits);
-    addOwnersEdits(*facts, {}, edits);
-    const std::size_t more = count * sizeOfEvent(filtered).charged;
-    if (facts->account && !facts->account->keepMore(taken.charge, more)) {
-      _posts.refusePost(*this, count, completion);
-      return std::nullopt;
-    }
-    // The events themselves were restricted when they were batched.
-    const bool restricts = !fitsJSON(filtered);
-    for (Dictionary& event : taken.events) {
-      event.merge(filtered);
-      if (restricts) _posts.restrict(event);
-    }
-    taken.jsonBytes += count * sizeOfEvent(filtered).json;
+  if (facts->sentUserInfo && !mergeUserInfo(taken, *facts, edits)) {
+    _posts.refusePost(*this, count, completion);
+    return std::nullopt;
   }
-  JSONMessage posted = createMessage(std::move(taken.events), *facts, taken.jsonBytes);
+  std::vector<std::string> events;
+  events.reserve(count);
+  for (EventBatch::Event& event : taken.events) events.push_back(std::move(event.text.json));
+  JSONMessage posted = createMessage(std::move(events), *facts);
   std::optional<std::string> pretty = std::move(posted.pretty);
   FlushCompletion whenPosted;
   std::size_t completionBytes = 0;
@@ -276,18 +280,38 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     };
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
-                         {std::move(posted.compact), std::nullopt, count, std::move(taken.charge),
+                         {std::move(posted.text), std::nullopt, count, std::move(taken.charge),
                           completionBytes, std::move(whenPosted), about(*facts, edits)});
   return pretty;
 }
 
-JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
-                                            std::size_t eventBytes) const {
-  constexpr std::size_t kEnvelope = 128;
+bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts,
+                                     config::EditedFields& edits) {
+  Dictionary info = *facts.sentUserInfo;
+  count(_clientState.filters().filterEvent(info, edits));
+  addOwnersEdits(facts, {}, edits);
+  const auto unsettled = static_cast<std::size_t>(std::count_if(
+      taken.events.begin(), taken.events.end(), [](const auto& event) { return !event.settled; }));
+  if (unsettled == 0) return true;
+  const std::size_t more = unsettled * sizeOfEvent(eventText(info)).charged;
+  if (facts.account && !facts.account->keepMore(taken.charge, more)) return false;
+  // The events themselves were restricted when they were written.
+  const bool restricts = !fitsJSON(info);
+  for (EventBatch::Event& event : taken.events) {
+    if (event.settled) continue;
+    changeEvent(event.text, [&](Dictionary& fields) {
+      fields.merge(info);
+      if (restricts) _posts.restrict(fields);
+    });
+  }
+  return true;
+}
+
+JSONMessage HTTPSPostBackend::createMessage(std::vector<std::string> events,
+                                            const SessionFacts& facts) const {
   const PostIdentity& identity = _clientState.identity();
-  const std::string& client = identity.clientIdentifier(facts.device);
-  return _posts.createMessageForPostAndLogging(std::move(events), client, identity.loggingAllowed(),
-                                               kEnvelope + client.size() + eventBytes);
+  return _posts.createMessageForPostAndLogging(std::move(events), identity.clientIdentifier(facts.device),
+                                               identity.loggingAllowed());
 }
 
 void HTTPSPostBackend::takeIdentity(const std::string& udid) {

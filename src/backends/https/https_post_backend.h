@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "backends/backend.h"
+#include "backends/https/event.h"
 #include "backends/https/held_events.h"
 #include "backends/https/https_post_state.h"
 #include "backends/https/json_message.h"
@@ -58,21 +59,20 @@ class HTTPSPostBackend final : public VeltraBackend {
                    const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
-  // Counts the changes; `changes` hears the names.
-  void filterEvent(Dictionary& event, config::FieldChanges& changes) const;
+  void count(const FilterTable::Outcome& outcome) const;
+  WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& message);
+  void noteUserInfo(const SessionFacts& facts);
+  Sent batchEvent(WrittenEvent event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
+  wire::Reason keep(std::int32_t method, EventBatch::Event event, platform::MemoryAccount* account,
+                    std::uint64_t sessionIDChanges);
+  Sent postEvent(WrittenEvent event, const SessionFacts& facts, const NumberedMessage& message);
+  // Merges the present user info into the events. False if there is no memory for it.
+  bool mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts, config::EditedFields& edits);
+  JSONMessage createMessage(std::vector<std::string> events, const SessionFacts& facts) const;
   // For the history of what left, if one is kept: names of fields that the owner keeps back, too.
   bool recorded() const;
   void addOwnersEdits(const SessionFacts& facts, const MessageNote& note, config::EditedFields& edits) const;
   Dictionary about(const SessionFacts& facts, const config::EditedFields& edits) const;
-  Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges,
-                  const config::EditedFields& edits);
-  wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
-                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
-  Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message,
-                 const config::EditedFields& edits);
-  // `eventBytes` is an upper bound on the events' JSON texts.
-  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
-                            std::size_t eventBytes) const;
 
   platform::Locale& _locale;
   platform::Counters& _counters;
@@ -83,6 +83,11 @@ class HTTPSPostBackend final : public VeltraBackend {
   HTTPSPostState _clientState;
   // The batch is registered with the user's account.
   bool _evictable = false;
+  // With which the settled events of the batch were written.
+  SharedDictionary _writtenInfo;
+  FilterTable _writtenFilters;
+  // Of the last event; most of the next ones are about as long.
+  std::size_t _lastLength = 0;
   // Of the events in the batch, and perhaps of some that were dropped from it.
   config::EditedFields _batchEdits;
 

@@ -57,8 +57,8 @@ std::string linesOf(const CommandLine& line, const std::string& complete, const 
   const std::string before = condition.empty() ? "" : condition + "; and ";
   for (const CommandLine& command : line.commands) {
     lines += fmt::format("{} -n {} -a {} -d {}\n", complete,
-                         fishQuoted(before + "not __fish_seen_subcommand_from" + names), command.name,
-                         fishQuoted(command.about));
+                         fishQuoted(fmt::format("{}not __fish_seen_subcommand_from{}", before, names)),
+                         command.name, fishQuoted(command.about));
     lines +=
         linesOf(command, complete, fmt::format("{}__fish_seen_subcommand_from {}", before, command.name));
   }

@@ -52,7 +52,7 @@ class HeaderPage {
     if (text.starts_with(kTitle)) {
       const std::size_t end = text.rfind(" ----");
       _page += "\n### " + escaped(text.substr(kTitle.size(), end - kTitle.size())) + "\n";
-    } else if (!text.empty() || close == std::string_view::npos) {
+    } else if (!text.starts_with("SPDX-") && (!text.empty() || close == std::string_view::npos)) {
       _comment += std::string(text) + '\n';
     }
     if (close == std::string_view::npos) return;

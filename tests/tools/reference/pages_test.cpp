@@ -35,7 +35,7 @@ TEST(Pages, AreCurrent) {
     expectCurrent(entry.path(), page.value());
     ++pages;
   }
-  EXPECT_EQ(pages, 7u);
+  EXPECT_EQ(pages, 8u);
   for (const MadeFile& file : madeFiles()) expectCurrent(kSources / file.path, file.make());
 }
 
