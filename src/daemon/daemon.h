@@ -10,6 +10,7 @@
 #include "config/storebag_store.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
+#include "platform/fate_ring.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
@@ -18,7 +19,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 13 fields are these objects, in the order in which they need each other, and what the owner said last.
+// 14 fields are these objects, in the order in which they need each other, and what the owner said last.
 class Daemon {
  public:
   explicit Daemon(Services& services);
@@ -31,6 +32,7 @@ class Daemon {
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
+  const platform::FateRing& fates() const { return _fates; }
 
  private:
   Services& _services;
@@ -38,6 +40,7 @@ class Daemon {
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
   config::OperatorSettings _choices;
+  platform::FateRing _fates;
   backends::SamplingFactors _sampling;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;

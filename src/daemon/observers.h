@@ -11,6 +11,7 @@
 #include "daemon/metrics.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
+#include "platform/fate_ring.h"
 
 namespace veltrad::ipc {
 class Listener;
@@ -26,7 +27,8 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, double started);
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
+            const platform::FateRing& fates, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -52,12 +54,14 @@ class Observers final : public ipc::ListenerDelegate {
   Answer unsetPreference(const Dictionary& arguments);
   Answer refresh(const Dictionary& arguments);
   Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
+  Answer fates(const Dictionary& arguments);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
   Doctor& _doctor;
+  const platform::FateRing& _fates;
   const double _started;
   config::PreferenceEditor _preferences;
 };

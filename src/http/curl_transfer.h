@@ -33,6 +33,7 @@ class CurlTransfer {
   std::string hostName() const { return http::hostName(_request.url); }
   std::size_t events() const { return _request.events; }
   std::uint64_t bodySize() const { return _bodySize; }
+  bool hasBegun() const { return _begun; }
   // True at the first call.
   bool beginsFirst() { return !std::exchange(_begun, true); }
   std::uintptr_t sequence() const { return _request.sequence; }

@@ -59,6 +59,7 @@ struct Server {
     char text[INET_ADDRSTRLEN] = {};
     return inet_ntop(AF_INET, &address->sin_addr, text, sizeof text);
   }
+  std::string url() const { return "udp://" + host() + ":" + std::to_string(ntohs(address->sin_port)); }
   DashboardQueues::Route routeOf(const platform::MemoryAccount* account) const {
     return {address->sin_addr.s_addr, address->sin_port, reliable, period, DashboardQueues::userOf(account)};
   }
@@ -91,7 +92,10 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, server.host(), making.gate};
+  const NetworkProcQueue::Kind kind{reliable,      making.oneShot,
+                                    server.period, server.host(),
+                                    making.gate,   {making.fates, wire::kVeltraBackendDashboard},
+                                    server.url()};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
@@ -165,7 +169,7 @@ DashboardBackend::~DashboardBackend() {
 Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, *forbidden});
   }
   tagReportingPacket packet;
   packet.header = headerOf(message);
@@ -177,7 +181,10 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
 
   std::string line = writeLocalLog(packet);
   const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
-  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID), std::move(line)};
+  wire::StepEntry fate = stepOf(message);
+  fate.text = pen().textOf(_networkProcQueue->url());
+  fate.bytes = static_cast<std::uint32_t>(length);
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, fate), std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
@@ -202,16 +209,33 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
   return header;
 }
 
-bool DashboardBackend::uploadLogData(const Array& logData) {
+bool DashboardBackend::uploadLogData(const Array& logData, const MessageNote& note) {
+  wire::StepEntry fate;
+  fate.message = note.number;
   if (prohibition()) {
     _counters.count(wire::Reason::log_data_refused_by_owner);
+    pen().write(wire::Step::dropped, wire::Reason::log_data_refused_by_owner, fate);
     return false;
   }
-  const auto location = _uploads.upload(_postURL, logData);
+  const auto location = _uploads.upload(_postURL, logData, pen(), fate);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
-  sendMessage(payload, _clock.now(), 0, 2, 0);
+  const platform::TimeValue now = _clock.now();
+  sendMessage(payload, now, 0, 2, 0, notedMessage(now, note.session));
   return true;
+}
+
+// The message is of this back end alone.
+MessageNote DashboardBackend::notedMessage(platform::TimeValue now, wire::FateRef session) const {
+  if (!pen().writes()) return {};
+  wire::MessageEntry entry;
+  entry.from = wire::MessageEntry::From::session;
+  entry.session = session;
+  entry.message = pen().ring()->nextMessage();
+  entry.time = platform::FateRing::microseconds(now);
+  entry.type = 2;
+  pen().ring()->write(entry);
+  return {nullptr, entry.message, session};
 }
 
 void DashboardBackend::cleanup() {

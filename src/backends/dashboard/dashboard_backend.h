@@ -30,6 +30,7 @@ struct DashboardMaking {
   std::shared_ptr<platform::MemoryAccount> account;
   bool oneShot = false;
   config::OwnerGate* gate = nullptr;
+  platform::FateRing* fates = nullptr;
 };
 
 // The initialisers return null, after one error line, if the back end cannot work.
@@ -56,7 +57,7 @@ class DashboardBackend final : public VeltraBackend {
 
   // The text is the dashboard text line of the message.
   Sent sendNumberedMessage(NumberedMessage&& message) override;
-  bool uploadLogData(const Array& logData) override;
+  bool uploadLogData(const Array& logData, const MessageNote& note) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;
 
@@ -67,6 +68,7 @@ class DashboardBackend final : public VeltraBackend {
                    const config::DashboardProfile* profile, const std::string& productFamily);
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
+  MessageNote notedMessage(platform::TimeValue now, wire::FateRef session) const;
 
   LogDataUploads& _uploads;
   platform::Clock& _clock;

@@ -47,9 +47,13 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _account(std::move(account)),
       _queues(std::move(queues)),
       _socket(std::move(socket)),
-      _messageQueue(kind.reliableUDP, kind.shared,
-                    [this](std::string_view datagram)
-                        REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); }),
+      _messageQueue(
+          kind.reliableUDP, kind.shared,
+          [this](std::string_view datagram)
+              REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); },
+          [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
+            note(message, step, reason);
+          }),
       _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
@@ -66,24 +70,52 @@ bool NetworkProcQueue::startReading(WorkPool& pool) {
   return _readSource != nullptr;
 }
 
-wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber) {
+wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
+                                              const wire::StepEntry& fate) {
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
     _counters.count(wire::Reason::ended_before_sent);
+    _kind.pen.write(wire::Step::dropped, wire::Reason::ended_before_sent, fate);
     return {wire::Fate::dropped, wire::Reason::ended_before_sent};
   }
   // Its bytes are counted with each transmission.
   if (!mayLeave(1, 0)) {
     _counters.count(wire::Reason::datagram_over_daily_limit);
+    _kind.pen.write(wire::Step::dropped, wire::Reason::datagram_over_daily_limit, fate);
     return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
-  const MessageQueue::First first = _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge));
+  const MessageQueue::First first =
+      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), fate.message);
+  noteFirst(first, fate);
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
   return decisionOf(first.fate, _kind.reliableUDP);
+}
+
+void NetworkProcQueue::note(std::uint64_t message, wire::Step step, wire::Reason reason) const {
+  wire::StepEntry fate;
+  fate.message = message;
+  fate.status = step == wire::Step::sent && _kind.reliableUDP ? 1 : 0;
+  if (message != 0) _kind.pen.write(step, reason, fate);
+}
+
+// And of the one that it pushed out.
+void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEntry fate) const {
+  const wire::Decision decision = decisionOf(first.fate, _kind.reliableUDP);
+  const bool held = first.fate == wire::Reason::datagram_held;
+  const bool dropped = decision.fate == wire::Fate::dropped;
+  // Whether its acknowledgement is awaited.
+  fate.status = decision.fate == wire::Fate::waiting ? 1 : 0;
+  _kind.pen.write(dropped ? wire::Step::dropped
+                  : held  ? wire::Step::held
+                          : wire::Step::sent,
+                  first.fate, fate);
+  if (!first.pushedOut) return;
+  note(first.pushedOutMessage, first.pushedOutSent ? wire::Step::given_up : wire::Step::dropped,
+       *first.pushedOut);
 }
 
 bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
@@ -135,6 +167,14 @@ void NetworkProcQueue::end() {
 void NetworkProcQueue::dropWaiting() {
   const Lock held(_mutex);
   _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
+  clear(wire::Reason::datagram_refused_by_owner, wire::Reason::datagram_refused_by_owner);
+}
+
+void NetworkProcQueue::clear(wire::Reason ofSent, wire::Reason ofNotSent) {
+  for (const UDPPacketToSend& one : _messageQueue.pending()) {
+    const bool sent = one.state == UDPPacketToSend::awaitsAcknowledgement;
+    note(one.message, sent ? wire::Step::given_up : wire::Step::dropped, sent ? ofSent : ofNotSent);
+  }
   _messageQueue.clear();
 }
 
@@ -143,7 +183,7 @@ void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();
   _counters.count(wire::Reason::ended_before_sent, notSent);
   _counters.count(reason, _messageQueue.size() - notSent);
-  _messageQueue.clear();
+  clear(reason, wire::Reason::ended_before_sent);
 }
 
 void NetworkProcQueue::armTimer(DeliverySchedule::Time time) {

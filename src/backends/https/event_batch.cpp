@@ -27,16 +27,19 @@ bool EventBatch::full(const EventSize& event) const {
   return _events.size() >= kMostEvents || _bytes.json + event.json > kMostBytes;
 }
 
-void EventBatch::add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn) {
+void EventBatch::add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn,
+                     std::uint64_t message) {
   account(size);
-  _events.push_back({std::move(event), size, turn});
+  _events.push_back({std::move(event), size, turn, message});
   ++_counts[method];
 }
 
-void EventBatch::dropOldest() {
-  if (_events.empty()) return;
+std::uint64_t EventBatch::dropOldest() {
+  if (_events.empty()) return 0;
+  const std::uint64_t message = _events.front().message;
   unaccount(_events.front().size);
   _events.pop_front();
+  return message;
 }
 
 void EventBatch::setSessionID(const std::string& sessionID) {

@@ -39,8 +39,11 @@ class EventBatch {
   bool thresholdReached(std::int32_t method, std::int32_t threshold) const;
   // Whether the event would exceed a bound.
   bool full(const EventSize& event) const;
-  void add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn);
-  void dropOldest();
+  // `message`: its number in the record of fates.
+  void add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn,
+           std::uint64_t message = 0);
+  // Returns the number of its message.
+  std::uint64_t dropOldest();
   // Called after a flush that a threshold caused, whatever its result.
   void restartCount(std::int32_t method) { _counts[method] = 0; }
 
@@ -55,6 +58,7 @@ class EventBatch {
     Dictionary fields;
     EventSize size;
     std::uint64_t turn;
+    std::uint64_t message;
   };
   void account(const EventSize& size);
   void unaccount(const EventSize& size);

@@ -35,6 +35,10 @@ FilterAction actionOn(const config::Filters& filters, const std::string& key, st
 }
 }  // namespace
 
+bool FilterTable::concerns(const std::string& name) const {
+  return _filters && !_filters->ofKey.empty() && _filters->ofKey.contains(lowerCase(name));
+}
+
 FilterTable::Outcome FilterTable::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
   Outcome outcome;
   if (!_filters || _filters->ofKey.empty()) return outcome;

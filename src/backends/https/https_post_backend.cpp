@@ -6,6 +6,7 @@
 
 #include "backends/https/event.h"
 #include "backends/https/event_posts.h"
+#include "config/noted_changes.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
@@ -50,7 +51,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
       _counters(making.counters),
       _posts(making.posts),
       _clientState(*this, profile, making.locale, making.counters, making.identity),
-      _held(std::make_shared<HeldEvents>(making.counters)) {
+      _held(std::make_shared<HeldEvents>(making.counters, making.pen)) {
   setDisplayURL(profile->displayURL);
 }
 
@@ -67,7 +68,7 @@ std::vector<std::string> HTTPSPostBackend::hosts() const {
 }
 
 void HTTPSPostBackend::dropWaiting() {
-  _counters.count(wire::Reason::refused_by_owner, _held->discard());
+  _held->discard(wire::Reason::refused_by_owner);
 }
 
 BackendActivity HTTPSPostBackend::activity() const {
@@ -79,7 +80,7 @@ BackendActivity HTTPSPostBackend::activity() const {
 Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const StateVerdict verdict = stateVerdict(); verdict.state == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, verdict.reason}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, verdict.reason});
   }
   _counters.eventTaken();
   // Read before the facts, so that a change between the two is noticed.
@@ -99,8 +100,12 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   Dictionary event =
       createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
   if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
-  config::EditedFields edits;
-  filterEvent(event, edits);
+  {
+    config::NotedChanges changes(
+        pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
+    if (facts->userInfoEdits) changes.changed(*facts->userInfoEdits);
+    filterEvent(event, changes);
+  }
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -111,7 +116,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   const bool userInfoMissing = facts->requireUserInfo && !facts->userInfo;
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batching) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batching, facts->requireUserInfo);
-    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges);
+    return batchEvent(std::move(event), message, facts->account.get(), sessionIDChanges);
   }
   return postEvent(std::move(event), *facts, message);
 }
@@ -133,8 +138,9 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   std::optional<platform::Charge> charge{std::in_place};
   const EventSize size = sizeOfEvent(event);
   if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
+  const wire::StepEntry fate = stepOf(message);
   if (!charge) {
-    return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
+    return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr, fate)}, std::move(flushed)};
   }
   std::vector<Dictionary> events;
   events.push_back(std::move(event));
@@ -148,7 +154,7 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
                              {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr});
+                              std::move(*charge), 0, nullptr, fate});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -169,8 +175,8 @@ void HTTPSPostBackend::filterEvent(Dictionary& event, config::FieldChanges& chan
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
-Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* account,
-                                  std::uint64_t sessionIDChanges) {
+Sent HTTPSPostBackend::batchEvent(Dictionary event, const NumberedMessage& message,
+                                  platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
   // User info and filters may have changed the event's method.
   const std::int32_t method = event.int32("_method").value_or(0);
   // Removes these fields now, so that they take no memory until the flush.
@@ -188,28 +194,25 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, platform::MemoryAccount* acc
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
   }
-  const wire::Reason kept = keep(std::move(event), size, method, account, sessionIDChanges);
-  _counters.count(kept);
-  if (kept != wire::Reason::event_batched) return {{wire::Fate::dropped, kept}, std::move(flushed)};
+  // Drops events of the user's other batches if necessary.
+  auto charge = account ? account->keep(size.charged) : platform::Charge();
   const StateVerdict verdict = stateVerdict();
   const bool reports = verdict.state == kBackendReporting;
-  return {{reports ? wire::Fate::batched : wire::Fate::held, verdict.reason}, std::move(flushed)};
-}
-
-// Drops events of the user's other batches if necessary.
-wire::Reason HTTPSPostBackend::keep(Dictionary event, const EventSize& size, std::int32_t method,
-                                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
-  auto charge = account ? account->keep(size.charged) : platform::Charge();
-  if (!charge) return wire::Reason::event_over_share;
+  Sent sent{{reports ? wire::Fate::batched : wire::Fate::held, verdict.reason}, std::move(flushed)};
+  _counters.count(charge ? wire::Reason::event_batched : wire::Reason::event_over_share);
+  if (!charge) {
+    sent.decision = settled(message, {wire::Fate::dropped, wire::Reason::event_over_share}).decision;
+    return sent;
+  }
   if (account && !std::exchange(_evictable, true)) account->add(_held);
   _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
-             sessionIDChanges);
-  return wire::Reason::event_batched;
+             sessionIDChanges, reports ? wire::Step::batched : wire::Step::held, stepOf(message));
+  return sent;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (state() != kBackendReporting) {
-    _counters.count(wire::Reason::flushed_unreported, _held->discard());
+    _held->discard(wire::Reason::flushed_unreported);
   }
   if (_held->empty()) {
     if (completion) completion(std::nullopt, wire::makeReportingError("Nothing to flush", -1));
@@ -224,13 +227,14 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
-  if (const SharedDictionary& sent = facts->sentUserInfo) {
-    Dictionary filtered = *sent;
-    config::EditedFields edits;
-    filterEvent(filtered, edits);
+  wire::StepEntry fate;
+  fate.batch = taken.batch;
+  pen().write(wire::Step::flushed, std::nullopt, fate);
+  if (facts->sentUserInfo) {
+    const Dictionary filtered = refilled(*facts, taken.batch);
     const std::size_t more = count * sizeOfEvent(filtered).charged;
     if (facts->account && !facts->account->keepMore(taken.charge, more)) {
-      _posts.refusePost(*this, count, completion);
+      _posts.refusePost(*this, count, completion, fate);
       return std::nullopt;
     }
     // The events themselves were restricted when they were batched.
@@ -254,8 +258,30 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
                          {std::move(posted.compact), std::nullopt, count, std::move(taken.charge),
-                          completionBytes, std::move(whenPosted)});
+                          completionBytes, std::move(whenPosted), fate});
   return pretty;
+}
+
+// What a flush adds to each event of the batch: the user info, filtered without the methods and statuses of
+// the events. A field that the event's own filter had changed may so leave as it is.
+Dictionary HTTPSPostBackend::refilled(const SessionFacts& facts, std::uint64_t batch) const {
+  const Dictionary& sent = *facts.sentUserInfo;
+  const config::EditedFields* kept = facts.userInfoEdits.get();
+  Dictionary filtered = sent;
+  config::EditedFields edits;
+  filterEvent(filtered, edits);
+  if (!pen().writes()) return filtered;
+  config::NotedChanges changes(pen(), {.time = pen().ring()->now(), .batch = batch});
+  for (const auto& [name, value] : sent) {
+    const bool hashed = edits.hashed.contains(name) || (kept && kept->hashed.contains(name));
+    if (edits.removed.contains(name)) continue;
+    if (hashed) {
+      changes.changed(config::FieldChange::hashed, name);
+    } else if (_clientState.filters().concerns(name)) {
+      changes.restored(name);
+    }
+  }
+  return filtered;
 }
 
 JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, const SessionFacts& facts,

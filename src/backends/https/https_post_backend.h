@@ -23,6 +23,7 @@ struct HTTPSPostMaking {
   platform::Locale& locale;
   platform::Counters& counters;
   EventPosts& posts;
+  platform::FatePen pen;
   PostIdentity::Sources identity;
 };
 
@@ -51,10 +52,11 @@ class HTTPSPostBackend final : public VeltraBackend {
   void addStopFields(Dictionary& payload, bool batching) const;
   // Counts the changes; `changes` hears the names.
   void filterEvent(Dictionary& event, config::FieldChanges& changes) const;
-  Sent batchEvent(Dictionary event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
-  wire::Reason keep(Dictionary event, const EventSize& size, std::int32_t method,
-                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
+  Sent batchEvent(Dictionary event, const NumberedMessage& message, platform::MemoryAccount* account,
+                  std::uint64_t sessionIDChanges);
   Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message);
+  Dictionary refilled(const SessionFacts& facts, std::uint64_t batch) const;
+  ClientMatch clientMatch() const override { return _clientState.match(); }
   // `eventBytes` is an upper bound on the events' JSON texts.
   JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
                             std::size_t eventBytes) const;

@@ -19,7 +19,7 @@
 namespace veltrad::backends {
 
 // Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. What an
-// update does not reach keeps its earlier value.
+// update does not reach keeps its earlier value. Its 13 fields are the profile, the services and the results.
 class HTTPSPostState {
  public:
   // `profile` has "clients".
@@ -42,6 +42,8 @@ class HTTPSPostState {
   const FilterTable& filters() const { return _filters; }
   std::int32_t eventThreshold() const { return _eventThreshold; }
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
+  // Of the client entry that decides, or, if the session requires no user info, has given the address.
+  const ClientMatch& match() const { return _match; }
 
  private:
   void applyExpedite(const config::ClientEntry& entry);
@@ -66,6 +68,7 @@ class HTTPSPostState {
   std::optional<bool> _batchEvents;
   std::int32_t _eventThreshold = 49;
   std::optional<double> _overrideSampling;
+  ClientMatch _match;
 };
 
 }  // namespace veltrad::backends

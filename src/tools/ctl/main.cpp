@@ -11,6 +11,7 @@
 #include "tools/ctl/session_command.h"
 #include "tools/ctl/stats_command.h"
 #include "tools/ctl/status_command.h"
+#include "tools/ctl/why_command.h"
 
 int main(int argc, char** argv) {
   using namespace veltrad::ctl;
@@ -40,6 +41,10 @@ int main(int argc, char** argv) {
       return runRefresh(options);
     case Command::report:
       return runReport(options);
+    case Command::why:
+      return runWhy(options);
+    case Command::watch:
+      return runWatch(options, interrupt);
     case Command::session:
       return runSession(options, interrupt);
     default:

@@ -23,7 +23,7 @@ namespace {
 constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
-    "metrics, doctor, config, refresh or report";
+    "metrics, doctor, config, refresh, report, why or watch";
 
 // Arguments in text form.
 struct Texts {

@@ -10,6 +10,7 @@
 
 #include "base/value.h"
 #include "tools/command_line.h"
+#include "tools/ctl/fate_filter.h"
 
 namespace veltrad::ctl {
 
@@ -41,7 +42,9 @@ enum class Command {
   configSet,
   configUnset,
   refresh,
-  report
+  report,
+  why,
+  watch
 };
 
 // Of the commands for those who look after a device.
@@ -55,6 +58,10 @@ struct Care {
   // report: the file to write.
   std::optional<std::string> output;
   bool yes = false;
+  // why, watch.
+  FateFilter fates;
+  std::size_t last = 20;
+  bool contents = false;
 };
 
 // Its 13 fields are the command's options and arguments, by name.
