@@ -139,6 +139,34 @@ def body_for(header, bodies):
     return None
 
 
+def bodies_of_rooms():
+    return {path for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"}
+
+
+def changed_bodies(changed):
+    """The bodies that changed and, for each header that changed, one that includes it."""
+    bodies = bodies_of_rooms()
+    files = {ROOT / name for name in changed if name.startswith(("src/", "include/"))}
+    headers = {path for path in files if path.suffix in (".h", ".hpp") and path.exists()}
+    return bodies & (files | {body_for(path, bodies) for path in headers})
+
+
+def check_alone(bodies):
+    """Compiles each body by itself: where bodies are joined, one can lack a header that another has included before."""
+    configure("lint")
+    commands = [entry for entry in json.loads((ROOT / "build/lint/compile_commands.json").read_text())
+                if Path(entry["file"]) in bodies]
+
+    def compile_alone(entry):
+        command = shlex.split(entry["command"].partition(" -o ")[0]) + ["-fsyntax-only", entry["file"]]
+        done = subprocess.run(command, cwd=entry["directory"], capture_output=True, text=True)
+        return re.findall(r"^.*: (?:fatal )?error: .*$", done.stderr, re.M) or (
+            [] if done.returncode == 0 else [f"{entry['file']}: {done.stderr.strip()}"])
+
+    with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
+        return sorted({line.replace(f"{ROOT}/", "") for lines in pool.map(compile_alone, commands) for line in lines})
+
+
 def lint_units(bodies):
     """Divides the bodies of each folder of CMake into units of at most LARGEST_UNIT, largest first: pairs of the bodies and
     the flags they are compiled with. A unit becomes one file, because most of clang-tidy's time goes into the headers."""
@@ -173,14 +201,12 @@ def lint(unit):
     return found or ([] if done.returncode == 0 else [f"{bodies[0]}: clang-tidy failed: {done.stderr.strip()}"])
 
 
-def check_lint(changed=None):
-    """Lints the bodies that changed and, for each header that changed, one that includes it. None: all bodies."""
+def check_lint():
+    return lint_bodies(bodies_of_rooms())
+
+
+def lint_bodies(bodies):
     configure("lint")
-    bodies = {path for path in sources(".cpp") if path.relative_to(ROOT).parts[0] == "src"}
-    if changed is not None:
-        files = {ROOT / name for name in changed if name.startswith(("src/", "include/"))}
-        headers = {path for path in files if path.suffix in (".h", ".hpp") and path.exists()}
-        bodies = bodies & (files | {body_for(path, bodies) for path in headers})
     with concurrent.futures.ThreadPoolExecutor(os.cpu_count()) as pool:
         found = {line for lines in pool.map(lint, lint_units(bodies)) for line in lines}
     # A room's header is included through the link to the room's folder.
@@ -196,7 +222,8 @@ def main():
     if arguments == ["--no-lint"]:
         del checks["lint"]
     elif arguments[:1] == ["--changed"] and len(arguments) <= 2:
-        checks = {"lint of what changed": lambda: check_lint(changed_files(*arguments[1:]))}
+        changed = changed_bodies(changed_files(*arguments[1:]))
+        checks = {"compiled alone": lambda: check_alone(changed), "lint of what changed": lambda: lint_bodies(changed)}
     elif arguments:
         sys.exit(f"scripts/check: unknown argument {arguments[0]}; expected --no-lint or --changed [COMMIT]")
     failed = 0

@@ -8,7 +8,8 @@ import time
 from pathlib import Path
 
 ROOT = Path(__file__).resolve().parent.parent
-PRESETS = ["dev", "asan", "tsan"]
+ALL = ["dev", "asan", "tsan"]
+PRESETS = [*ALL, "plain"]
 TIMEOUT_SECONDS = 900
 SANITIZER_OPTIONS = {
     "ASAN_OPTIONS": "detect_leaks=1:detect_stack_use_after_return=1:abort_on_error=0",
@@ -60,7 +61,7 @@ def programs(preset):
         yield [str(program), "--gtest_brief=1"]
     for program in sorted(binaries.glob("replay_*")):
         yield [str(program), "tests/fuzz/corpus/" + program.name.removeprefix("replay_")]
-    if preset == "dev":
+    if preset in ("dev", "plain"):
         yield [sys.executable, "tests/must_not_compile/run.py"]
     yield [sys.executable, "tests/e2e/run.py"]
 
@@ -82,7 +83,7 @@ def test(preset):
 
 
 def main():
-    presets = PRESETS if sys.argv[1:] == ["all"] else sys.argv[1:] or ["dev"]
+    presets = ALL if sys.argv[1:] == ["all"] else sys.argv[1:] or ["dev"]
     unknown = [preset for preset in presets if preset not in PRESETS]
     if unknown:
         sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected all, or some of: {' '.join(PRESETS)}")

@@ -3,19 +3,19 @@ _veltractl() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} path="" words="" given=0 i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output) ((i++)) ; continue ;;
+      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output | --html) ((i++)) ; continue ;;
     esac
     case $path+${COMP_WORDS[i]} in
-      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats) path+=/${COMP_WORDS[i]} ;;
+      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats | +privacy | /privacy+off | /privacy+on | /privacy+reset-identifiers | +history | /history+show | /history+purge) path+=/${COMP_WORDS[i]} ;;
       *+-*) ;;
       *) ((given++)) ;;
     esac
   done
   COMPREPLY=()
   case $previous in
-    --input | -o | --output) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
+    --input | -o | --output | --html) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
     --root) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- "$current"); return ;;
-    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output) return ;;
+    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output | --html) return ;;
   esac
   case $path in
     "/session") words=" --aggregate --input --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
@@ -35,7 +35,14 @@ _veltractl() {
     "/report") words=" -o --output --yes" ;;
     "/doctor") words=" --client-type" ;;
     "/stats") words="" ;;
-    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics config refresh report doctor stats" ;;
+    "/privacy/off") words="" ;;
+    "/privacy/on") words="" ;;
+    "/privacy/reset-identifiers") words="" ;;
+    "/privacy") words=" off on reset-identifiers" ;;
+    "/history/show") words=" --raw" ;;
+    "/history/purge") words="" ;;
+    "/history") words=" --html show purge" ;;
+    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics config refresh report doctor stats privacy history" ;;
   esac
   [[ $path == "" ]] || words+=" --root --json --version -h --help"
   if [[ $current != -* ]]; then

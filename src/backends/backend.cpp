@@ -106,6 +106,7 @@ void VeltraBackend::setUserInfoDict(const UserInfo& info) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
   changed->take(info);
+  changed->client = clientOf(*changed);
   _facts = std::move(changed);
 }
 
@@ -113,6 +114,13 @@ void VeltraBackend::setCorrelatedSessionID(const std::string& sessionID) {
   const Lock held(_mutex);
   auto changed = std::make_shared<SessionFacts>(*_facts);
   changed->combinedSessionIDString = sessionID;
+  _facts = std::move(changed);
+}
+
+void VeltraBackend::takeIdentity(const std::string& udid) {
+  const Lock held(_mutex);
+  auto changed = std::make_shared<SessionFacts>(*_facts);
+  changed->device.udid = udid;
   _facts = std::move(changed);
 }
 

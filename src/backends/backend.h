@@ -104,9 +104,15 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
   virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken,
-                                const MessageNote& note = {});
-  virtual bool uploadLogData(const Array& logData, const MessageNote& note = {});
+                                const MessageNote& note);
+  virtual bool uploadLogData(const Array& logData, const MessageNote& note);
   virtual void setCorrelatedSessionID(const std::string& sessionID);
+  // The device has another identifier, and the back end makes others of its own.
+  virtual void takeIdentity(const std::string& udid);
+  // The owner has given or withdrawn consent where the policy asks for it on open sessions, too.
+  virtual void rereadConsent() {}
+  // Drops what waits and bears the device's identifier. Any thread.
+  virtual void dropIdentified() {}
 
   // Constant after construction.
   const std::string& name() const { return _name; }

@@ -68,7 +68,8 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
          _services.counters,
          _posts,
          {_services.fates, name},
-         {_services.preferences, _services.library, _services.settings}},
+         {_services.preferences, _services.library, _services.settings},
+         _services.gate},
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {

@@ -81,6 +81,8 @@ class BackendFactory {
   void dropWaiting(const std::function<bool(const std::string& host)>& refuses) {
     _dashboards->dropWaiting(refuses);
   }
+  // Whose files wait for a place or are being compressed.
+  FileUploads::Preparing preparingFiles() { return _files.preparing(); }
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,

@@ -66,6 +66,10 @@ struct SessionFacts {
   SharedDictionary sentUserInfo;
   // What of the user info differs between the two.
   config::SharedEdits userInfoEdits;
+  // Whose messages these are, for the owner of the device; made of the fields above.
+  SharedDictionary client;
+  // What the back ends were made from: {"name", "version", "section"}.
+  SharedDictionary storebag;
   std::optional<std::string> combinedSessionIDString;
   // Pays for what is kept.
   std::shared_ptr<platform::MemoryAccount> account;
@@ -77,6 +81,13 @@ struct SessionFacts {
   }
 };
 using SharedFacts = std::shared_ptr<const SessionFacts>;
+
+// {"clientType", "sessionID", "client", "service"}; names that may not leave are not among them.
+SharedDictionary clientOf(const SessionFacts& facts);
+// What else the history of what left says of it: {"backend", "storebag", "entry", "removed", "hashed"}.
+// `entry`: the number of the client entry, counted from 0.
+Dictionary aboutDeparture(const std::string& backend, const SessionFacts& facts,
+                          std::optional<std::size_t> entry, const config::EditedFields& edits);
 
 // Client types 7, 11 and 13: they have an adaptor, and numeric session IDs on internal builds.
 constexpr bool isAdaptorClientType(std::int32_t clientType) {

@@ -28,7 +28,7 @@ std::string textOf(double number) {
   };
   std::string text = write(std::chars_format::scientific);
   if (!std::isfinite(number)) return text;
-  const int exponent = std::atoi(text.c_str() + text.find('e') + 1);
+  const long exponent = std::strtol(text.c_str() + text.find('e') + 1, nullptr, 10);
   if (exponent > kLastWithExponent && exponent < kFirstWithExponent) return write(std::chars_format::fixed);
   return text;
 }

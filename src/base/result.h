@@ -41,7 +41,11 @@ class [[nodiscard]] Result {
     if (!ok()) std::abort();
     return std::move(*std::get_if<0>(&_side));
   }
-  const E& error() const {
+  E& error() & {
+    if (ok()) std::abort();
+    return *std::get_if<1>(&_side);
+  }
+  const E& error() const& {
     if (ok()) std::abort();
     return *std::get_if<1>(&_side);
   }

@@ -15,7 +15,6 @@ namespace key = veltrad::wire::key;
 namespace operation = veltrad::wire::operation;
 
 using client::Answer;
-using client::CallFrame;
 using veltrad::Dictionary;
 
 struct veltra_session {

@@ -2,6 +2,7 @@
 // Who hears which fields of a message were taken out, or had their values hidden.
 #pragma once
 
+#include <cstddef>
 #include <memory>
 #include <set>
 #include <string>
@@ -18,13 +19,21 @@ class FieldChanges {
   virtual void changed(FieldChange change, std::string_view name) = 0;
 };
 
-// Keeps the names. Allocates nothing before the first.
+// Keeps the names: of each kind the first 256, because a client can write a name in any number of letter
+// cases. Allocates nothing before the first.
 struct EditedFields final : FieldChanges {
+  static constexpr std::size_t kMost = 256;
+
   std::set<std::string> removed;
   std::set<std::string> hashed;
 
   void changed(FieldChange change, std::string_view name) override {
-    (change == FieldChange::removed ? removed : hashed).emplace(name);
+    auto& names = change == FieldChange::removed ? removed : hashed;
+    if (names.size() < kMost) names.emplace(name);
+  }
+  void add(const EditedFields& others) {
+    for (const std::string& name : others.removed) changed(FieldChange::removed, name);
+    for (const std::string& name : others.hashed) changed(FieldChange::hashed, name);
   }
   bool empty() const { return removed.empty() && hashed.empty(); }
 };

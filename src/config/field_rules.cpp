@@ -25,7 +25,7 @@ std::unordered_set<std::string> lowered(const TextList& names) {
 
 }  // namespace
 
-FieldRules::FieldRules(const PolicyRules& rules, std::string secret)
+FieldRules::FieldRules(const PolicyRules& rules, std::optional<std::string> secret)
     : _remove(lowered(rules.remove)), _hash(lowered(rules.hash)), _secret(std::move(secret)) {}
 
 FieldRules::Rule FieldRules::ruleOf(std::string_view name) const {
@@ -39,6 +39,7 @@ bool FieldRules::removes(std::string_view name) const {
 }
 
 std::optional<std::string> FieldRules::digest(const Value& value) const {
+  if (!_secret) return std::nullopt;
   std::string text;
   switch (value.type()) {
     case Value::Type::string:
@@ -57,7 +58,7 @@ std::optional<std::string> FieldRules::digest(const Value& value) const {
   }
   unsigned char bytes[32];
   unsigned length = 0;
-  if (HMAC(EVP_sha256(), _secret.data(), static_cast<int>(_secret.size()),
+  if (HMAC(EVP_sha256(), _secret->data(), static_cast<int>(_secret->size()),
            reinterpret_cast<const unsigned char*>(text.data()), text.size(), bytes, &length) == nullptr)
     std::abort();
   return hex({reinterpret_cast<const char*>(bytes), length});
@@ -81,7 +82,7 @@ std::optional<Dictionary> FieldRules::edited(const Dictionary& dictionary, Field
     if (rule == Rule::keep) {
       auto inner = edited(value, changes);
       changed = changed || inner.has_value();
-      entries.emplace_back(name, inner ? std::move(*inner) : value);
+      entries.emplace_back(name, inner ? std::move(*inner) : Value(value));
       continue;
     }
     changed = true;

@@ -17,9 +17,10 @@ namespace veltrad::config {
 // one that is to be removed and hashed nothing stays.
 class FieldRules {
  public:
-  // `secret`: of this device; the key of the digests.
-  FieldRules(const PolicyRules& rules, std::string secret);
+  // `secret`: of this device; the key of the digests. Without one, fields that are to be hashed are removed.
+  FieldRules(const PolicyRules& rules, std::optional<std::string> secret);
 
+  bool madeWith(const std::optional<std::string>& secret) const { return secret == _secret; }
   bool empty() const { return _remove.empty() && _hash.empty(); }
   // True if a field of this name is removed.
   bool removes(std::string_view name) const;
@@ -28,7 +29,8 @@ class FieldRules {
   bool apply(Dictionary& message, FieldChanges& changes) const;
   void apply(Value& value, FieldChanges& changes) const;
   // The value that stands for one that is to be hashed: the HMAC-SHA-256 of a text, or of the JSON text of
-  // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed.
+  // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed, and
+  // everything while there is no secret.
   std::optional<std::string> digest(const Value& value) const;
 
  private:
@@ -40,7 +42,7 @@ class FieldRules {
 
   std::unordered_set<std::string> _remove;
   std::unordered_set<std::string> _hash;
-  const std::string _secret;
+  const std::optional<std::string> _secret;
 };
 
 }  // namespace veltrad::config

@@ -5,7 +5,6 @@
 #include <utility>
 
 #include "config/settings_check.h"
-#include "platform/log.h"
 
 namespace veltrad::config {
 namespace {
@@ -123,65 +122,26 @@ void take(const Key&, const Value& value, Sampling& field) {
   field = text && *text == "stable" ? Sampling::stable : Sampling::drawn;
 }
 
-// Logged once the lock is released.
-struct OperatorSettings::Said {
-  std::optional<std::string> error;
-  std::vector<std::string> warnings;
-  bool lastStands = false;
-
-  void log() const {
-    if (error && lastStands) logError("Settings could not be read, the last ones stand: %s", error->c_str());
-    if (error && !lastStands)
-      logError("Settings could not be read, no storebag is accepted: %s", error->c_str());
-    for (const std::string& warning : warnings) logWarning("Settings: %s", warning.c_str());
-  }
-};
+namespace {
+std::shared_ptr<const OperatorChoices> choicesIn(const platform::LocalContent& content,
+                                                 const std::shared_ptr<const OperatorChoices>& before,
+                                                 SettingsLines& lines) {
+  using Kind = platform::LocalContent::Kind;
+  SettingsFindings found;
+  if (content.kind == Kind::broken) found.error = content.error;
+  if (content.kind == Kind::good) found = checkSettings(content, OperatorChoices::kKeys);
+  if (content.warning) found.warnings.insert(found.warnings.begin(), *content.warning);
+  for (const std::string& warning : found.warnings) lines.warnings.push_back("Settings: " + warning);
+  if (content.kind == Kind::absent) return std::make_shared<const OperatorChoices>();
+  if (!found.error)
+    return std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*content.value.asDictionary()));
+  const char* meanwhile = before ? "the last ones stand: " : "no storebag is accepted: ";
+  lines.errors.push_back(std::string("Settings could not be read, ") + meanwhile + *found.error);
+  return before;
+}
+}  // namespace
 
 OperatorSettings::OperatorSettings(platform::FileStore& files, const std::string& path)
-    : _file(files, path) {}
-
-std::shared_ptr<const OperatorChoices> OperatorSettings::current() {
-  Said said;
-  std::shared_ptr<const OperatorChoices> now;
-  {
-    const Lock held(_mutex);
-    refresh(said);
-    now = _choices;
-  }
-  said.log();
-  return now;
-}
-
-void OperatorSettings::readAgain() {
-  {
-    const Lock held(_mutex);
-    _file.readAgain();
-  }
-  static_cast<void>(current());
-}
-
-void OperatorSettings::refresh(Said& said) {
-  using Kind = platform::LocalContent::Kind;
-  auto now = _file.content();
-  if (!now || now.value() == _content) return;
-  _content = std::move(now).value();
-  if (_content->warning) said.warnings.push_back(*_content->warning);
-  if (_content->kind == Kind::absent) {
-    _choices = std::make_shared<const OperatorChoices>();
-    return;
-  }
-  SettingsFindings found;
-  if (_content->kind == Kind::broken) {
-    found.error = _content->error;
-  } else {
-    found = checkSettings(*_content, OperatorChoices::kKeys);
-  }
-  said.error = std::move(found.error);
-  said.lastStands = _choices != nullptr;
-  said.warnings.insert(said.warnings.end(), found.warnings.begin(), found.warnings.end());
-  if (!said.error)
-    _choices =
-        std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*_content->value.asDictionary()));
-}
+    : SettingsFollower(files, path, choicesIn, nullptr) {}
 
 }  // namespace veltrad::config

@@ -4,12 +4,10 @@
 #pragma once
 
 #include <cstdint>
-#include <memory>
 #include <string>
 
-#include "base/mutex.h"
 #include "config/key_table.h"
-#include "platform/local_settings.h"
+#include "config/settings_follower.h"
 
 namespace veltrad::config {
 
@@ -54,24 +52,10 @@ struct OperatorChoices {
 
 // A file that is broken, unreadable or holds a value of a wrong type or out of its range is one error line a
 // change, and the last good content stands. A key that is unknown or has no effect is one warning a change.
-class OperatorSettings {
+class OperatorSettings final : public SettingsFollower<OperatorChoices> {
  public:
-  // `path`: of either form.
+  // `path`: of either form. What holds is null while the file has never been good, or could not be read yet.
   OperatorSettings(platform::FileStore& files, const std::string& path);
-
-  // What holds now; null: the file has never been good, or cannot be read just now and was not yet.
-  std::shared_ptr<const OperatorChoices> current();
-  // Reads the file now, whether it has changed or not.
-  void readAgain();
-
- private:
-  struct Said;
-  void refresh(Said& said) REQUIRES(_mutex);
-
-  Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  platform::LocalSettings _file GUARDED_BY(_mutex);
-  std::shared_ptr<const platform::LocalContent> _content GUARDED_BY(_mutex);  // null before the first reading
-  std::shared_ptr<const OperatorChoices> _choices GUARDED_BY(_mutex);         // null while there are none
 };
 
 }  // namespace veltrad::config

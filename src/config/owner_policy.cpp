@@ -2,65 +2,23 @@
 // Which content of policy.json holds. Any thread.
 #include "config/owner_policy.h"
 
-#include <optional>
-#include <utility>
-
-#include "platform/log.h"
-
 namespace veltrad::config {
 
-// Logged once the lock is released.
-struct OwnerPolicy::Said {
-  std::string error;
-  std::optional<std::string> warning;
-
-  void log() const {
-    if (warning) logWarning("Policy: %s", warning->c_str());
-    if (!error.empty()) logError("Policy could not be read, nothing leaves: %s", error.c_str());
-  }
-};
-
-OwnerPolicy::OwnerPolicy(platform::FileStore& files, const std::string& path) : _file(files, path) {}
-
-std::shared_ptr<const Policy> OwnerPolicy::current() {
-  Said said;
-  std::shared_ptr<const Policy> now;
-  {
-    const Lock held(_mutex);
-    refresh(said);
-    now = _policy;
-  }
-  said.log();
-  return now;
-}
-
-std::shared_ptr<const Policy> OwnerPolicy::readAgain() {
-  {
-    const Lock held(_mutex);
-    _file.readAgain();
-  }
-  return current();
-}
-
-void OwnerPolicy::refresh(Said& said) {
+namespace {
+std::shared_ptr<const Policy> policyIn(const platform::LocalContent& content,
+                                       const std::shared_ptr<const Policy>&, SettingsLines& lines) {
   using Kind = platform::LocalContent::Kind;
-  auto now = _file.content();
-  if (!now || now.value() == _content) return;
-  _content = std::move(now).value();
-  said.warning = _content->warning;
-  switch (_content->kind) {
-    case Kind::absent:
-      _policy = std::make_shared<const Policy>();
-      return;
-    case Kind::broken:
-      said.error = _content->error;
-      _policy = nullptr;
-      break;
-    case Kind::good:
-      _policy = Policy::of(*_content, said.error);
-      break;
-  }
-  if (!_policy) _policy = Policy::closed();
+  if (content.warning) lines.warnings.push_back("Policy: " + *content.warning);
+  if (content.kind == Kind::absent) return std::make_shared<const Policy>();
+  std::string error = content.error;
+  auto policy = content.kind == Kind::good ? Policy::of(content, error) : nullptr;
+  if (policy) return policy;
+  lines.errors.push_back("Policy could not be read, nothing leaves: " + error);
+  return Policy::closed();
 }
+}  // namespace
+
+OwnerPolicy::OwnerPolicy(platform::FileStore& files, const std::string& path)
+    : SettingsFollower(files, path, policyIn, Policy::closed()) {}
 
 }  // namespace veltrad::config

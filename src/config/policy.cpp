@@ -113,7 +113,10 @@ std::shared_ptr<const Policy> Policy::of(const platform::LocalContent& content, 
     error = std::move(*found.error);
     return nullptr;
   }
-  return std::make_shared<const Policy>(parsed<PolicyRules>(*content.value.asDictionary()));
+  const Dictionary& given = *content.value.asDictionary();
+  auto policy = std::make_shared<Policy>(parsed<PolicyRules>(given));
+  policy->_asGiven = given;
+  return policy;
 }
 
 std::optional<wire::Reason> Policy::refusal(bool consent) const {

@@ -64,6 +64,9 @@ class Policy {
   static std::shared_ptr<const Policy> of(const platform::LocalContent& content, std::string& error);
 
   const PolicyRules& rules() const { return _rules; }
+  bool broken() const { return _broken; }
+  // What the file says; nothing without one that is good.
+  const std::optional<Dictionary>& asGiven() const { return _asGiven; }
   // Why no back end reports: policy_broken, policy_reporting, policy_consent; nothing: each may.
   std::optional<wire::Reason> refusal(bool consent) const;
   // Whether a back end of this name is made.
@@ -74,6 +77,7 @@ class Policy {
 
  private:
   PolicyRules _rules;
+  std::optional<Dictionary> _asGiven;
   bool _broken = false;
 };
 

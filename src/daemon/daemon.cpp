@@ -2,8 +2,6 @@
 // Passes the services to the rooms.
 #include "daemon/daemon.h"
 
-#include "platform/log.h"
-
 namespace veltrad::daemon {
 
 namespace {
@@ -30,22 +28,8 @@ Daemon::Daemon(Services& services)
       _storebags(services.http, _settings, _library, _choices, _storebagStore, services.counters),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
               services.counters, _flushes, _messageLog, services.gate, &_fates},
-             _storebags, services.transaction) {}
-
-void Daemon::hearOwner() {
-  const bool changed = _services.gate.refresh();
-  if (changed) {
-    const auto word = _services.gate.word();
-    logInfo("hearOwner: The owner's word has changed: %s",
-            word->refusal ? wire::entryOf(*word->refusal).name.data() : "back ends may report");
-    _agent.tellOwnersWord(*word);
-    _factory.dropWaiting([&word](const std::string& host) {
-      return word->refusal.has_value() || !word->policy->reaches(host);
-    });
-  }
-  if (changed || _graceRuns) _services.http.endRefused(!changed);
-  _graceRuns = changed;
-}
+             _storebags, services.transaction),
+      _privacy(services, _agent, _factory, _library) {}
 
 void Daemon::readConfigurationAgain() {
   _services.entitlements.readAgain();
@@ -53,7 +37,7 @@ void Daemon::readConfigurationAgain() {
   _settings.readDeploymentAgain();
   _choices.readAgain();
   _services.policy.readAgain();
-  hearOwner();
+  _privacy.hearOwner();
 }
 
 }  // namespace veltrad::daemon

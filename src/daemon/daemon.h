@@ -8,6 +8,7 @@
 #include "config/process_settings.h"
 #include "config/storebag_section.h"
 #include "config/storebag_store.h"
+#include "daemon/privacy.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
 #include "platform/fate_ring.h"
@@ -19,15 +20,13 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 14 fields are these objects, in the order in which they need each other, and what the owner said last.
+// 14 fields are these objects, in the order in which they need each other.
 class Daemon {
  public:
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
-  // Reads the owner's word again and, if it has changed, stops what may not leave any more. Called several
-  // times a second.
-  void hearOwner();
+  Privacy& privacy() { return _privacy; }
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
@@ -48,8 +47,7 @@ class Daemon {
   config::StorebagStore _storebagStore;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
-  // The word has changed, and requests that had begun have been given until the next call.
-  bool _graceRuns = false;
+  Privacy _privacy;
 };
 
 }  // namespace veltrad::daemon

@@ -281,7 +281,7 @@ Check checkConsent(Consent consent) {
               "correct etc/veltrad/policy.json; the daemon's log names the line and column"};
     case Consent::reportingOff:
       return {kName, Outcome::warning, "nothing may leave: the owner of the device has turned reporting off",
-              "the owner's choice, in policy.json or the preference ReportingOff"};
+              "the owner's choice: \"reporting\" in policy.json, or veltractl privacy on"};
     case Consent::notKnown:
       break;
   }

@@ -149,6 +149,12 @@ platform::StateFile::State allowanceState(const config::DailyAllowance& allowanc
           [&allowance] { return allowance.text(); }};
 }
 
+platform::StateFile::State destinationsState(const config::Destinations& destinations) {
+  return {"What left in the last day",
+          [&destinations] { return platform::StateFile::Version{destinations.version()}; },
+          [&destinations] { return destinations.text(); }};
+}
+
 platform::StateFile::State metricsState(daemon::Observers& observers) {
   const auto version = [&observers] {
     const daemon::Gauges gauges = observers.gauges();
@@ -162,6 +168,7 @@ struct StateFiles {
   platform::StateFile& counters;
   platform::StateFile& metrics;
   platform::StateFile& allowance;
+  platform::StateFile& destinations;
 };
 
 void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
@@ -175,13 +182,16 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
   std::uint64_t accepted = 0;
   int ownerTicks = 0;
   const auto onTick = [&] {
-    daemon.hearOwner();
+    daemon.privacy().hearOwner();
+    services.history.writeSoon();
     if (++ownerTicks < kOwnerTicks) return;
     ownerTicks = 0;
     services.allowance.load();
+    services.destinations.load();
     files.counters.writeSoon();
     files.metrics.writeSoon();
     if (services.allowance.version() > 0) files.allowance.writeSoon();
+    if (services.destinations.version() > 0) files.destinations.writeSoon();
     // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
     const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
                       services.memory.used() == 0 && services.http.underWay() == 0;
@@ -216,7 +226,9 @@ bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& co
   services.http.drain(deadline - 500ms);
   services.pool.drain(deadline - 300ms);
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
+  services.history.writeNow(deadline - 250ms);
   if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
+  if (services.destinations.version() > 0) files.destinations.writeLast(deadline - 150ms);
   const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
   if (!written) logWarning("main: the disk did not take everything within the time of a stop");
@@ -270,14 +282,19 @@ int main(int count, char** arguments) {
                                    services.root.countersPath());
   platform::StateFile allowanceFile(allowanceState(services.allowance), services.files, services.writer,
                                     services.root.allowancePath());
+  platform::StateFile destinationsFile(destinationsState(services.destinations), services.files,
+                                       services.writer, services.root.destinationsPath());
+  services.history.mend();
   services.allowance.load();
+  services.destinations.load();
   services.gate.refresh();
   daemon::Daemon daemon(services);
   ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
                           services.counters, services.memory, services.root.entitlementsPath()},
                          daemon.agent());
   daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
-  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.fates(), started);
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
+                              started);
   ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
                          services.counters, services.observersMemory, services.root.entitlementsPath(),
                          kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
@@ -288,7 +305,7 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  const StateFiles files{countersFile, metricsFile, allowanceFile};
+  const StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
   serve(services, daemon, listener, files, loop);
 
   const bool ended = stop(services, listener, control, files);

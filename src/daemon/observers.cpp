@@ -6,6 +6,7 @@
 
 #include "base/version.h"
 #include "daemon/doctor.h"
+#include "daemon/history_answers.h"
 #include "daemon/refresh.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
@@ -42,6 +43,13 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
       {question::kRefresh, Right::control, &Observers::refresh},
       {question::kFates, Right::observe, &Observers::fates},
+      {question::kPrivacy, Right::control, &Observers::privacy},
+      {question::kTurnReportingOff, Right::control, &Observers::turnReportingOff},
+      {question::kTurnReportingOn, Right::control, &Observers::turnReportingOn},
+      {question::kResetIdentifiers, Right::control, &Observers::resetIdentifiers},
+      {question::kHistory, Right::control, &Observers::history},
+      {question::kHistoryBody, Right::control, &Observers::historyBody},
+      {question::kPurgeHistory, Right::control, &Observers::purgeHistory},
       {question::kDoctor, Right::observe, nullptr, &Observers::doctor},
   };
   for (const Question& question : kQuestions) {
@@ -96,11 +104,12 @@ class Observers::Desk final : public ipc::Observer {
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
-                     const platform::FateRing& fates, double started)
+                     Privacy& privacy, const platform::FateRing& fates, double started)
     : _services(services),
       _agent(agent),
       _clients(clients),
       _doctor(doctor),
+      _privacy(privacy),
       _fates(fates),
       _started(started),
       _preferences(services.preferences, services.device) {}
@@ -183,6 +192,18 @@ Observers::Answer Observers::fates(const Dictionary& arguments) {
                     {"next", copy.next},           {"missing", copy.missing},
                     {"end", _fates.next()},        {"messages", messages},
                     {"size", _fates.size()},       {"refresh", _fates.refresh()}};
+}
+
+Observers::Answer Observers::history(const Dictionary& arguments) {
+  return historyPage(_services.history, arguments);
+}
+
+Observers::Answer Observers::historyBody(const Dictionary& arguments) {
+  return daemon::historyBody(_services.history, arguments);
+}
+
+Observers::Answer Observers::purgeHistory(const Dictionary&) {
+  return daemon::purgeHistory(_services.history);
 }
 
 Gauges Observers::gauges() {

@@ -9,6 +9,7 @@
 #include "base/value.h"
 #include "config/preference_editor.h"
 #include "daemon/metrics.h"
+#include "daemon/privacy.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
 #include "platform/fate_ring.h"
@@ -27,7 +28,7 @@ class VeltradAgent;
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
-  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
+  Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
             const platform::FateRing& fates, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
@@ -55,12 +56,20 @@ class Observers final : public ipc::ListenerDelegate {
   Answer refresh(const Dictionary& arguments);
   Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
   Answer fates(const Dictionary& arguments);
+  Answer privacy(const Dictionary&) { return _privacy.show(); }
+  Answer turnReportingOff(const Dictionary&) { return _privacy.turnOff(); }
+  Answer turnReportingOn(const Dictionary&) { return _privacy.turnOn(); }
+  Answer resetIdentifiers(const Dictionary&) { return _privacy.resetIdentifiers(); }
+  Answer history(const Dictionary& arguments);
+  Answer historyBody(const Dictionary& arguments);
+  Answer purgeHistory(const Dictionary& arguments);
   double now() const;
 
   Services& _services;
   VeltradAgent& _agent;
   ipc::Listener& _clients;
   Doctor& _doctor;
+  Privacy& _privacy;
   const platform::FateRing& _fates;
   const double _started;
   config::PreferenceEditor _preferences;

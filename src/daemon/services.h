@@ -5,6 +5,7 @@
 #include "backends/ampery/energy_log.h"
 #include "backends/dashboard/work_pool.h"
 #include "backends/mivo/code_bundle.h"
+#include "config/destinations.h"
 #include "config/owner_gate.h"
 #include "config/owner_policy.h"
 #include "http/http_client.h"
@@ -23,10 +24,11 @@
 #include "platform/root.h"
 #include "platform/service_manager.h"
 #include "platform/transaction.h"
+#include "support/history.h"
 
 namespace veltrad::daemon {
 
-// Its 23 fields are the services of the whole process.
+// Its 25 fields are the services of the whole process.
 struct Services {
   explicit Services(platform::Root where)
       : root(std::move(where)),
@@ -40,8 +42,12 @@ struct Services {
         secret(files, root.secretPath()),
         policy(files, root.policyPath()),
         allowance(files, clock, root.allowancePath()),
-        gate(policy, preferences, secret, allowance),
-        http({root.extraCertificatesPath(), &gate}) {}
+        destinations(files, clock, root.destinationsPath()),
+        history(clock, root.historyDirectory(), writer),
+        gate(policy, preferences, secret, allowance, &destinations, &history),
+        http({root.extraCertificatesPath(), &gate}) {
+    device.heedReset(preferences, secret);
+  }
 
   const platform::Root root;
   platform::MemoryBudget memory;
@@ -62,11 +68,13 @@ struct Services {
   platform::DeviceSecret secret;
   config::OwnerPolicy policy;
   config::DailyAllowance allowance;
+  config::Destinations destinations;
+  platform::DiskWriter writer;
+  support::History history;
   config::OwnerGate gate;
   http::CurlHTTPClient http;
   backends::WorkPool pool;
   platform::LentFiles lentFiles;
-  platform::DiskWriter writer;
 };
 
 }  // namespace veltrad::daemon

@@ -59,6 +59,13 @@ void VeltradAgent::tellOwnersWord(const config::OwnersWord& word) {
   }
 }
 
+void VeltradAgent::dropIdentified() {
+  for (const ListedSession& listed : _sessionList.all()) {
+    if (!listed.facts.backends) continue;
+    for (const auto& [name, backend] : *listed.facts.backends) backend->dropIdentified();
+  }
+}
+
 std::shared_ptr<const config::StorebagSection> VeltradAgent::storebagForSession(
     const session::VeltradSession& session) {
   const std::int32_t clientType = session.clientType().value_or(0);

@@ -50,6 +50,8 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   // Tells the back ends of all sessions what the owner's word is now; those that may not report drop what
   // waits.
   void tellOwnersWord(const config::OwnersWord& word);
+  // Drops what waits in the back ends of all sessions and bears the device's identifier.
+  void dropIdentified();
   std::size_t sessionCount() const { return _sessionList.size(); }
   std::uint64_t acceptedSessions() const { return _sessionList.accepted(); }
   std::size_t userInfoKeyCount() const { return _families.userInfoKeyCount(); }

@@ -30,12 +30,28 @@ Result<Value, JSONError> parseJSONWithComments(std::string_view text);
 std::optional<std::size_t> offsetInJSON(std::string_view text, const std::vector<std::string>& path);
 
 enum class JSONStyle { compact, pretty };
-// The reverse of parseJSON. A real that is not finite becomes null, an invalid byte of a text U+FFFD. If
-// `expectedBytes` is at least the length of the result, the buffer is allocated only once.
-std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact,
-                      std::size_t expectedBytes = 0);
-// The same into a string, which is overwritten and keeps its capacity.
-void writeJSON(const Value& value, JSONStyle style, std::string& out);
+// The reverse of parseJSON. A real that is not finite becomes null, an invalid byte of a text U+FFFD.
+std::string writeJSON(const Value& value, JSONStyle style = JSONStyle::compact);
+
+// Appends the readable form of a compact text, which may come in pieces, to a string: each field and element
+// on a line of its own.
+class JSONIndenter {
+ public:
+  explicit JSONIndenter(std::string& out) : _out(out) {}
+  void add(std::string_view compact);
+
+ private:
+  void addText(std::string_view& compact);
+  void newLine();
+
+  std::string& _out;
+  std::size_t _depth = 0;
+  // The last character was an opening bracket; it was inside a text; it was a backslash there.
+  bool _opened = false;
+  bool _inText = false;
+  bool _escaped = false;
+};
+
 // The first bytes of the compact text, at most `most` of them and whole characters, and the number of bytes
 // left out. The rest of the text is never in memory.
 struct JSONExcerpt {
@@ -43,7 +59,5 @@ struct JSONExcerpt {
   std::size_t leftOut = 0;
 };
 JSONExcerpt excerptOfJSON(const Value& value, std::size_t most);
-// An upper bound on the length of the compact text of a dictionary that holds no containers and no data.
-std::size_t jsonBytesAtMost(const Dictionary& flat);
 
 }  // namespace veltrad::formats

@@ -14,6 +14,7 @@
 #include <utility>
 
 #include "base/text.h"
+#include "http/header_lines.h"
 #include "platform/shortage.h"
 
 namespace veltrad::http {
@@ -37,25 +38,6 @@ std::string_view trimmed(std::string_view text) {
   while (!text.empty() && blank(text.front())) text.remove_prefix(1);
   while (!text.empty() && blank(text.back())) text.remove_suffix(1);
   return text;
-}
-
-// A token (RFC 9110, 5.6.2).
-bool isToken(std::string_view name) {
-  const auto allowed = [](char c) {
-    const auto byte = static_cast<unsigned char>(c);
-    return byte < 0x80 &&
-           (std::isalnum(byte) != 0 || std::string_view("!#$%&'*+-.^_`|~").find(c) != std::string_view::npos);
-  };
-  return !name.empty() && std::all_of(name.begin(), name.end(), allowed);
-}
-
-// "name: value", or "name;" for an empty value, as libcurl expects it.
-std::string headerLine(std::string_view name, std::string_view value) {
-  std::string clean(value);
-  clean.erase(std::remove_if(clean.begin(), clean.end(), isControl), clean.end());
-  clean.erase(0, clean.find_first_not_of(' '));
-  std::string line(name);
-  return clean.empty() ? line + ";" : line + ": " + clean;
 }
 
 // The part between "//" and the path.
@@ -161,32 +143,26 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
 
 bool CurlTransfer::setHeaders() {
   _headerList.reset();
-  // Headers that libcurl would add unless the request has them.
-  std::array<std::pair<const char*, bool>, 2> own{{{"Accept", false}, {"Content-Type", false}}};
-  bool lengthSaid = false;  // the request's own Content-Length only sets its position
-  const auto append = [this](const std::string& line) {
+  for (const std::string& line : headerLines(_request.headers, _bodySize)) {
     curl_slist* longer = curl_slist_append(_headerList.get(), line.c_str());
     if (longer == nullptr) return false;
     (void)_headerList.release();
     _headerList.reset(longer);
-    return true;
-  };
-  for (const auto& [name, value] : _request.headers) {
-    const std::string_view given = name;
-    const auto is = [given](const char* other) { return equalIgnoringCase(given, other); };
-    if (!isToken(given) || is("Transfer-Encoding") || is("Expect")) continue;
-    for (auto& [automatic, found] : own) found = found || is(automatic);
-    if (is("Content-Length")) {
-      if (std::exchange(lengthSaid, true)) continue;
-      if (!append(headerLine("Content-Length", std::to_string(_bodySize)))) return false;
-    } else if (!append(headerLine(name, value))) {
-      return false;
-    }
   }
-  for (const auto& [automatic, found] : own) {
-    if (!found && !append(std::string(automatic) + ":")) return false;
-  }
-  return append("Expect:") && curl_easy_setopt(_easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
+  return curl_easy_setopt(_easy, CURLOPT_HTTPHEADER, _headerList.get()) == CURLE_OK;
+}
+
+Departure CurlTransfer::departure() const {
+  using Kind = Departure::Kind;
+  const Kind kind = _request.lane == HTTPRequest::Lane::event    ? Kind::post
+                    : _request.lane == HTTPRequest::Lane::upload ? Kind::file
+                                                                 : Kind::logData;
+  return {kind, _request.url, _request.events, _bodySize, _request.client, _request.about};
+}
+
+void CurlTransfer::recordIn(RequestGate& gate, const Departure& departure) {
+  _record = gate.record(departure, sentLines(_host, headerLines(_request.headers, _bodySize)), _request.body,
+                        _request.fileBody ? _request.fileBody->file : nullptr);
 }
 
 void CurlTransfer::setBody(Options& options) {

@@ -18,7 +18,7 @@
 namespace veltrad::http {
 
 // Constructed on the caller's thread, then used only on the HTTP thread. `connections` must exist while an
-// easy handle is attached. Its 24 fields are the request, what libcurl is given, and the answer as it
+// easy handle is attached. Its 25 fields are the request, what libcurl is given, and the answer as it
 // arrives.
 class CurlTransfer {
  public:
@@ -31,8 +31,12 @@ class CurlTransfer {
   // "name:port" as in the URL: connections are counted by it.
   const std::string& host() const { return _host; }
   std::string hostName() const { return http::hostName(_request.url); }
-  std::size_t events() const { return _request.events; }
-  std::uint64_t bodySize() const { return _bodySize; }
+  RequestUnderWay underWay() const { return {_request.lane, _request.events}; }
+  // Not of a storebag request.
+  Departure departure() const;
+  void recordIn(RequestGate& gate, const Departure& departure);
+  // 0: it was not recorded.
+  std::uint64_t record() const { return _record; }
   bool hasBegun() const { return _begun; }
   // True at the first call.
   bool beginsFirst() { return !std::exchange(_begun, true); }
@@ -96,6 +100,7 @@ class CurlTransfer {
   Connections* _connections = nullptr;
   Connection _connection = Connection::kept;
   bool _begun = false;
+  std::uint64_t _record = 0;
   HeaderList _headerList{nullptr, curl_slist_free_all};
   std::array<char, CURL_ERROR_SIZE> _error{};
   // Bytes of the body's file that were sent.

@@ -22,11 +22,25 @@ std::optional<HTTPError> Gatekeeper::refusalOf(const CurlTransfer& transfer) con
   return asError(_gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName()));
 }
 
-// Once for each request, also if it begins anew on another connection.
 std::optional<HTTPError> Gatekeeper::overLimit(CurlTransfer& transfer) const {
   if (_gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag || !transfer.beginsFirst())
     return std::nullopt;
-  return asError(_gate->count(transfer.events(), transfer.bodySize()));
+  const Departure departure = transfer.departure();
+  if (auto refused = asError(_gate->count(departure))) return refused;
+  if (_gate->keepsRecords()) transfer.recordIn(*_gate, departure);
+  return std::nullopt;
+}
+
+void Gatekeeper::ended(const CurlTransfer& transfer, const HTTPResult& result) const {
+  if (_gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag) return;
+  const bool refused = !result && result.error().kind == HTTPError::Kind::refused &&
+                       result.error().refusal != wire::Reason::over_daily_limit;
+  if (refused && !transfer.hasBegun()) _gate->refused(transfer.departure());
+  if (transfer.record() == 0) return;
+  DepartureEnd end;
+  end.status = result ? result.value().status : result.error().status;
+  if (!result) end.error = result.error().description;
+  _gate->ended(transfer.record(), end);
 }
 
 // The gate is not asked under the queue's lock, so the hosts are collected first.

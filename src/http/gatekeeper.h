@@ -17,10 +17,14 @@ class Gatekeeper {
 
   // Why the request may not begin or go on; nothing: it may.
   std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
-  // Counts the request for the day, once, also if it begins anew on another connection.
+  // Counts the request for the day and records it, once, also if it begins anew on another connection.
   std::optional<HTTPError> overLimit(CurlTransfer& transfer) const;
   // Those that wait and may not begin.
   HTTPQueue::Transfers takeRefused(HTTPQueue& queue) const;
+  // Whether requests have to wait for room for their records.
+  bool hasNoRoom() const { return _gate != nullptr && !_gate->hasRoomForRecord(); }
+  // Tells the gate how a request that had begun has ended, or that one was refused.
+  void ended(const CurlTransfer& transfer, const HTTPResult& result) const;
 
  private:
   RequestGate* const _gate;

@@ -14,8 +14,6 @@
 #include <thread>
 
 #include "base/mutex.h"
-#include "base/text.h"
-#include "base/value.h"
 #include "http/connections.h"
 #include "http/curl_transfer.h"
 #include "http/gatekeeper.h"
@@ -23,23 +21,6 @@
 #include "platform/log.h"
 
 namespace veltrad::http {
-
-std::optional<std::string_view> HTTPResponse::header(std::string_view name) const {
-  for (const auto& [key, value] : headers) {
-    if (equalIgnoringCase(key, name)) return value;
-  }
-  return std::nullopt;
-}
-
-std::size_t keptBytes(const HTTPRequest& request) {
-  // The transfer with its list entries, and the two copies of each header.
-  constexpr std::size_t kTransfer = 1536, kCopies = 2, kHeader = 96;
-  std::size_t bytes = kTransfer + 2 * request.url.capacity() + blockBytes(request.body.capacity());
-  for (const auto& [name, value] : request.headers) {
-    bytes += kHeader + kCopies * (name.capacity() + value.capacity());
-  }
-  return bytes;
-}
 
 // Runs libcurl's multi interface and all completions on one thread. A lack of memory ends the transfer that
 // needs it, not the thread.
@@ -66,6 +47,8 @@ struct CurlHTTPClient::Impl {
   void run();
   void stop(const HTTPQueue::Predicate& matches);
   void endRefused(bool alsoRunning);
+  void answerRefusals();
+  void refuse(Transfers taken);
   void startNext();
   void startOne(Transfers one);
   bool begins(CURL* easy, CurlTransfer& transfer);
@@ -147,6 +130,7 @@ void CurlHTTPClient::Impl::run() {
     else if (orders.failBlocking)
       stop([](const CurlTransfer& transfer) { return transfer.blocking(); });
     if (orders.askWaiting) endRefused(orders.askRunning);
+    answerRefusals();
     int left = 0;
     curl_multi_perform(multi.get(), &left);
     finish();
@@ -170,25 +154,44 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
 // One that is missed for lack of memory is refused when it would begin.
 void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
   try {
-    for (Transfers taken = gate.takeRefused(queue); !taken.empty();) {
-      Transfers one = HTTPQueue::pop(taken, taken.begin());
-      // What was refused a moment ago is not put back if the gate has opened since.
-      const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
-      HTTPError refused = gate.refusalOf(one.front()).value_or(before);
-      complete(std::move(one), Failure{std::move(refused)});
-    }
+    refuse(gate.takeRefused(queue));
     for (auto next = running.begin(); alsoRunning && next != running.end();) {
       const auto at = next++;
-      if (auto refused = gate.refusalOf(*at)) end(takeRunning(at), Failure{std::move(*refused)});
+      if (auto error = gate.refusalOf(*at)) end(takeRunning(at), Failure{std::move(*error)});
     }
   } catch (const std::bad_alloc&) {
+  }
+}
+
+void CurlHTTPClient::Impl::refuse(Transfers taken) {
+  while (!taken.empty()) {
+    Transfers one = HTTPQueue::pop(taken, taken.begin());
+    // What was refused a moment ago is not put back if the gate has opened since.
+    const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
+    HTTPError error = gate.refusalOf(one.front()).value_or(before);
+    complete(std::move(one), Failure{std::move(error)});
+  }
+}
+
+void CurlHTTPClient::Impl::answerRefusals() {
+  const auto leaves = [](const CurlTransfer& transfer) {
+    return transfer.lane() != HTTPRequest::Lane::storebag;
+  };
+  for (HTTPQueue::Refusal& order : queue.takeRefusals()) {
+    std::vector<RequestUnderWay> underWay;
+    for (const CurlTransfer& transfer : running) {
+      if (leaves(transfer)) underWay.push_back(transfer.underWay());
+    }
+    refuse(order.all ? queue.take(leaves) : gate.takeRefused(queue));
+    order.answer.set_value(std::move(underWay));
   }
 }
 
 void CurlHTTPClient::Impl::startNext() {
   try {
     const auto now = std::chrono::steady_clock::now();
-    for (Transfers one = queue.next(now); !one.empty(); one = queue.next(now)) startOne(std::move(one));
+    const auto next = [&] { return queue.next(now, gate.hasNoRoom()); };
+    for (Transfers one = next(); !one.empty(); one = next()) startOne(std::move(one));
   } catch (const std::bad_alloc&) {
     // The others go on waiting until they time out.
   }
@@ -263,6 +266,7 @@ void CurlHTTPClient::Impl::end(Transfers one, HTTPResult result) {
 
 void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
   try {
+    gate.ended(one.front(), result);
     if (!result) {
       HTTPError error = result.error();
       error.begun = one.front().hasBegun();
@@ -322,6 +326,15 @@ bool CurlHTTPClient::stopping() const {
 void CurlHTTPClient::endRefused(bool running) {
   _impl->queue.endRefused(running);
   _impl->wake();
+}
+
+std::optional<std::vector<RequestUnderWay>> CurlHTTPClient::refuseWaiting(bool all,
+                                                                          std::chrono::milliseconds within) {
+  if (!_impl->started.load(std::memory_order_acquire)) return std::vector<RequestUnderWay>();
+  auto answer = _impl->queue.refuseWaiting(all);
+  _impl->wake();
+  if (answer.wait_for(within) != std::future_status::ready) return std::nullopt;
+  return answer.get();
 }
 
 void CurlHTTPClient::failBlockingWaits() {

@@ -51,6 +51,9 @@ struct HTTPRequest {
   platform::Charge charge;
   // Events in the body; a file and log data are one.
   std::size_t events = 1;
+  // As in Departure.
+  std::shared_ptr<const Dictionary> client;
+  Dictionary about;
   // If false, the answer's body is discarded; one that is too large ends the connection, but the status
   // counts.
   bool keepsAnswer = true;
@@ -128,6 +131,12 @@ struct HTTPClientSettings {
   RequestGate* gate = nullptr;
 };
 
+// A request that has begun.
+struct RequestUnderWay {
+  HTTPRequest::Lane lane;
+  std::size_t events = 0;
+};
+
 // "libcurl/7.88.1 OpenSSL/3.0.15 …": what requests are made with, as loaded.
 std::string transportLibraries();
 
@@ -145,6 +154,9 @@ class CurlHTTPClient final : public HTTPClient {
   // Asks the gate again for the requests that wait and, if `running`, for those that have begun; ends those
   // that it refuses.
   void endRefused(bool running);
+  // The same for those that wait, now; with `all`, whatever the gate says of them. Returns what has begun, in
+  // both cases without requests for storebags; nothing if that takes longer than `within`.
+  std::optional<std::vector<RequestUnderWay>> refuseWaiting(bool all, std::chrono::milliseconds within);
   // From now on perform() fails at once; this ends calls that wait, too.
   void failBlockingWaits();
   // Waits at most until `deadline` for all transfers to end, then ends the others with `stopping`.

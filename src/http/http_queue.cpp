@@ -43,6 +43,19 @@ void HTTPQueue::endRefused(bool running) {
   _orders.askRunning = _orders.askRunning || running;
 }
 
+std::future<std::vector<RequestUnderWay>> HTTPQueue::refuseWaiting(bool all) {
+  Refusal refusal{all, {}};
+  auto answer = refusal.answer.get_future();
+  const Lock lock(_mutex);
+  _refusals.push_back(std::move(refusal));
+  return answer;
+}
+
+std::vector<HTTPQueue::Refusal> HTTPQueue::takeRefusals() {
+  const Lock lock(_mutex);
+  return std::exchange(_refusals, {});
+}
+
 std::future<void> HTTPQueue::addEmptyTask() {
   std::promise<void> task;
   std::future<void> passed = task.get_future();
@@ -75,10 +88,11 @@ HTTPQueue::Orders HTTPQueue::look() {
 }
 
 // A stop may have been ordered since look(); then nothing more is begun.
-HTTPQueue::Transfers HTTPQueue::next(Time now) {
+HTTPQueue::Transfers HTTPQueue::next(Time now, bool storebagsAlone) {
   const Lock lock(_mutex);
   if (_orders.stopping) return {};
   if (!_storebags.empty()) return pop(_storebags, _storebags.begin());
+  if (storebagsAlone) return {};
   for (Bulk& bulk : _bulk) {
     if (Transfers one = nextOf(bulk); !one.empty()) return one;
   }

@@ -52,6 +52,12 @@ class HTTPQueue {
   bool blockingFails() const;
   void stop(bool forGood);
   void endRefused(bool running);
+  // Fulfilled by the HTTP thread, which takes the order with look().
+  struct Refusal {
+    bool all = false;
+    std::promise<std::vector<RequestUnderWay>> answer;
+  };
+  std::future<std::vector<RequestUnderWay>> refuseWaiting(bool all);
   // Ready when the HTTP thread has called look().
   std::future<void> addEmptyTask();
   // False if `deadline` passed first.
@@ -71,9 +77,10 @@ class HTTPQueue {
     bool askRunning = false;
   };
   Orders look();
-  // A transfer that may run now, which is counted as running; empty if none may. If std::bad_alloc is thrown,
-  // nothing has changed.
-  Transfers next(Time now);
+  std::vector<Refusal> takeRefusals();
+  // A transfer that may run now, which is counted as running; empty if none may. With `storebagsAlone`, the
+  // others wait. If std::bad_alloc is thrown, nothing has changed.
+  Transfers next(Time now, bool storebagsAlone = false);
   bool empty() const;
   // Removes the waiting transfers that match.
   using Predicate = std::function<bool(const CurlTransfer&)>;
@@ -118,6 +125,7 @@ class HTTPQueue {
   std::size_t _underWay GUARDED_BY(_mutex) = 0;
   std::size_t _events GUARDED_BY(_mutex) = 0;
   std::vector<std::promise<void>> _emptyTasks GUARDED_BY(_mutex);
+  std::vector<Refusal> _refusals GUARDED_BY(_mutex);
   // Whether something was added since the last look().
   bool _news GUARDED_BY(_mutex) = false;
   Orders _orders GUARDED_BY(_mutex);

@@ -1,12 +1,17 @@
 // SPDX-License-Identifier: Apache-2.0
-// Decides whether a request may leave the device. Any thread; asked before each request begins.
+// Decides whether a request may leave the device, and keeps account of what did. Any thread; asked before
+// each request begins.
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
+#include "base/file_descriptor.h"
+#include "base/value.h"
 #include "wire/reasons.h"
 
 namespace veltrad::http {
@@ -17,14 +22,50 @@ struct RequestRefusal {
   std::string text;
 };
 
+// A post of events, a datagram, a file or log data.
+struct Departure {
+  enum class Kind { post, datagram, file, logData };
+  Kind kind = Kind::post;
+  // The whole URL, or "udp://IP:PORT".
+  std::string to;
+  std::uint64_t events = 1;
+  // Of its body.
+  std::uint64_t bytes = 0;
+  // Whose it is: {"clientType", "sessionID", "client", "service"}. Null: not known.
+  std::shared_ptr<const Dictionary> client;
+  // {"backend", "storebag", "entry", "removed", "hashed"}.
+  Dictionary about;
+};
+
+// How a departure ended.
+struct DepartureEnd {
+  // Of the answer; 0: none.
+  int status = 0;
+  // One line; empty: none.
+  std::string error;
+  int transmissions = 1;
+};
+
 class RequestGate {
  public:
   virtual ~RequestGate() = default;
   // `host`: as the URL has it, without port. Nothing: it may begin.
   virtual std::optional<RequestRefusal> refusal(bool forStorebag, std::string_view host) const = 0;
   // Asked once for each request that may begin, but for a storebag's: counts it for the owner's limits of a
-  // day, or refuses it. `bytes`: of its body.
-  virtual std::optional<RequestRefusal> count(std::uint64_t events, std::uint64_t bytes) = 0;
+  // day, or refuses it.
+  virtual std::optional<RequestRefusal> count(const Departure& departure) = 0;
+  // Whether what leaves is recorded, so that `about` is of use.
+  virtual bool keepsRecords() const = 0;
+  // False: it is, and there is no room for a record just now. Nothing but storebag requests may begin then.
+  virtual bool hasRoomForRecord() const = 0;
+  // Records what begins now. The body is in `body` or, with so many bytes as the departure says, in `file`.
+  // Returns the number of the record; 0: nothing is recorded.
+  virtual std::uint64_t record(const Departure& departure, std::vector<std::string> headerLines,
+                               std::string_view body, std::shared_ptr<const FileDescriptor> file) = 0;
+  // One that waited, or would have begun, was refused for the owner's sake.
+  virtual void refused(const Departure& departure) = 0;
+  // Called once for each record.
+  virtual void ended(std::uint64_t record, const DepartureEnd& end) = 0;
 };
 
 }  // namespace veltrad::http

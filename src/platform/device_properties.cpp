@@ -2,9 +2,17 @@
 // The configured list first, then the machine. Any thread; the machine's files are read at each question.
 #include "platform/device_properties.h"
 
+#include <openssl/evp.h>
+#include <openssl/hmac.h>
+
+#include <cstdlib>
+
+#include "base/text.h"
+#include "platform/device_secret.h"
 #include "platform/file_store.h"
 #include "platform/log.h"
 #include "platform/machine_facts.h"
+#include "platform/preferences.h"
 
 namespace veltrad::platform {
 
@@ -32,8 +40,33 @@ DeviceProperty MachineProperties::value(std::string_view key) {
   // The machine's value does not stand in: it may differ.
   if (!list) return Failure{list.error()};
   const std::string* text = list.value().string(key);
-  if (!text) return fromMachine(key);
+  if (!text) return key == "UniqueDeviceID" ? sinceReset(fromMachine(key)) : fromMachine(key);
   return text->empty() ? std::nullopt : std::optional(*text);
+}
+
+bool MachineProperties::configures(std::string_view key) {
+  const auto list = configured();
+  return list && list.value().string(key) != nullptr;
+}
+
+void MachineProperties::heedReset(Preferences& preferences, DeviceSecret& secret) {
+  _preferences = &preferences;
+  _secret = &secret;
+}
+
+DeviceProperty MachineProperties::sinceReset(const DeviceProperty& machines) {
+  if (!_preferences || !machines || !machines.value()) return machines;
+  const auto reset = _preferences->lookUp(kVeltraPreferenceDomain, kIdentifiersReset);
+  if (!reset) return Failure{reset.error()};
+  if (!reset.value()) return machines;
+  const auto secret = _secret->bytes();
+  if (!secret) return Failure{FileFailure{FileFailure::Kind::shortage, "the secret of this device"}};
+  const std::string& text = *machines.value();
+  unsigned char digest[EVP_MAX_MD_SIZE];
+  if (HMAC(EVP_sha256(), secret->data(), static_cast<int>(secret->size()),
+           reinterpret_cast<const unsigned char*>(text.data()), text.size(), digest, nullptr) == nullptr)
+    std::abort();
+  return std::optional(hex({reinterpret_cast<const char*>(digest), 20}));
 }
 
 void MachineProperties::readAgain() {

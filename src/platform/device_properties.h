@@ -15,6 +15,12 @@
 
 namespace veltrad::platform {
 
+class DeviceSecret;
+class Preferences;
+
+// When the owner of the device has reset its identifiers: a date.
+inline constexpr const char* kIdentifiersReset = "IdentifiersReset";
+
 // Absent if there is no value. A failure is a shortage: the value cannot be determined now, and the failure
 // must not be cached.
 using DeviceProperty = Result<std::optional<std::string>, FileFailure>;
@@ -36,16 +42,25 @@ class MachineProperties final : public DeviceProperties {
  public:
   // `devicePath`: of either form.
   MachineProperties(FileStore& files, const std::string& devicePath);
+  // From now on, "UniqueDeviceID" of the machine is derived from the secret as well, once the preference
+  // kIdentifiersReset is set. Before other threads ask; the arguments outlive it.
+  void heedReset(Preferences& preferences, DeviceSecret& secret);
   DeviceProperty value(std::string_view key) override;
+  // Whether the configured list has the key. False also during a shortage.
+  bool configures(std::string_view key);
   // Reads the configured list now, whether it has changed or not.
   void readAgain();
 
  private:
   DeviceProperty fromMachine(std::string_view key);
+  // The identifier that stands for the machine's since the owner has reset it.
+  DeviceProperty sinceReset(const DeviceProperty& machines);
   Result<Dictionary, FileFailure> configured();
   static void complain(const LocalContent& content);
 
   FileStore& _files;
+  Preferences* _preferences = nullptr;
+  DeviceSecret* _secret = nullptr;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   LocalSettings _file GUARDED_BY(_mutex);
   // As last read; what stands in during a shortage.

@@ -52,4 +52,12 @@ std::optional<std::string> DeviceSecret::bytes() {
   return secret;
 }
 
+Result<Done, FileFailure> DeviceSecret::renew() {
+  std::string secret = randomBytes();
+  const Lock held(_mutex);
+  auto written = _files.replace(_path, secret);
+  if (written) _bytes = std::move(secret);
+  return written;
+}
+
 }  // namespace veltrad::platform

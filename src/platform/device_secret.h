@@ -6,6 +6,7 @@
 #include <string>
 
 #include "base/mutex.h"
+#include "base/result.h"
 #include "platform/file_store.h"
 
 namespace veltrad::platform {
@@ -22,6 +23,8 @@ class DeviceSecret {
 
   // Nothing: for a shortage nobody can say what is stored, so nothing was made.
   std::optional<std::string> bytes();
+  // Makes and stores another secret. If that fails, the one before stays.
+  Result<Done, FileFailure> renew();
 
  private:
   FileStore& _files;

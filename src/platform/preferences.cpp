@@ -2,6 +2,7 @@
 // Preference domains as property list files.
 #include "platform/preferences.h"
 
+#include <chrono>
 #include <utility>
 
 #include "formats/property_list.h"
@@ -58,12 +59,42 @@ Result<Done, std::string> FilePreferences::change(std::string_view domain, std::
   Complaints complaints;
   auto changed = [&] {
     Lock lock(_mutex);
-    auto written = write(domain, key, value, complaints);
+    auto written = write(
+        domain, key,
+        [&](Dictionary& all) {
+          if (!value) return all.erase(key);
+          all.set(std::string(key), *value);
+          return true;
+        },
+        complaints);
     if (written) _unstored.erase(nameOf(domain, key));
     return written;
   }();
   logAll(complaints);
   return changed;
+}
+
+Result<Done, std::string> FilePreferences::edit(std::string_view domain, std::string_view what,
+                                                const Edit& edit) {
+  Complaints complaints;
+  const auto changed = [&]() -> Result<Done, std::string> {
+    Lock lock(_mutex);
+    auto written = write(domain, what, edit, complaints);
+    if (written) _unstored = {};
+    return written;
+  }();
+  logAll(complaints);
+  return changed;
+}
+
+Result<Dictionary, FileFailure> FilePreferences::all(std::string_view domain) {
+  Complaints complaints;
+  const auto found = [&] {
+    Lock lock(_mutex);
+    return known(domain, complaints);
+  }();
+  logAll(complaints);
+  return found;
 }
 
 std::optional<std::string> FilePreferences::textOrStore(std::string_view domain, std::string_view key,
@@ -152,27 +183,33 @@ Result<Dictionary, FileFailure> FilePreferences::refused(const std::string& path
 
 bool FilePreferences::store(std::string_view domain, std::string_view key, const Value& value,
                             Complaints& complaints) {
-  const auto stored = write(domain, key, value, complaints);
+  const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
+  const auto stored = write(
+      domain, key,
+      [&](Dictionary& all) {
+        const Dictionary* before = all.dictionary(kMadeAt);
+        Dictionary times = before ? *before : Dictionary();
+        times.set(std::string(key), Date{now.count()});
+        all.set(kMadeAt, std::move(times));
+        all.set(std::string(key), value);
+        return true;
+      },
+      complaints);
   if (!stored) complaints.push_back(stored.error());
   return stored.ok();
 }
 
-Result<Done, std::string> FilePreferences::write(std::string_view domain, std::string_view key,
-                                                 const std::optional<Value>& value, Complaints& complaints) {
+Result<Done, std::string> FilePreferences::write(std::string_view domain, std::string_view what,
+                                                 const Edit& edit, Complaints& complaints) {
   const std::string path = pathOf(domain);
   auto all = read(domain, complaints);
   if (!all) {
-    return Failure{"Preference not stored, its file cannot be read: " + path + ", " + std::string(key)};
+    return Failure{"Preference not stored, its file cannot be read: " + path + ", " + std::string(what)};
   }
-  Dictionary changed = std::move(all).value();
-  if (value) {
-    changed.set(std::string(key), *value);
-  } else if (!changed.erase(key)) {
-    return Done();
-  }
-  const auto stored = _files.replace(path, writeBinaryPropertyList(changed));
+  if (!edit(all.value())) return Done();
+  const auto stored = _files.replace(path, writeBinaryPropertyList(all.value()));
   if (stored) return Done();
-  return Failure{"Preference not stored: " + stored.error().description + ", " + std::string(key)};
+  return Failure{"Preference not stored: " + stored.error().description + ", " + std::string(what)};
 }
 
 }  // namespace veltrad::platform

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -17,6 +18,8 @@
 namespace veltrad::platform {
 
 inline constexpr std::string_view kVeltraPreferenceDomain = "com.florn.veltra";
+// When the texts that were made were made: a dictionary of dates.
+inline constexpr const char* kMadeAt = "madeAt";
 
 class Preferences {
  public:
@@ -50,6 +53,12 @@ class FilePreferences final : public Preferences {
   // which was not logged.
   Result<Done, std::string> change(std::string_view domain, std::string_view key,
                                    const std::optional<Value>& value);
+  // Changes many keys at once, and forgets the texts that could not be stored. `edit` gets all keys and is
+  // called under the lock; it returns whether it has changed something. `what` names them in the error.
+  using Edit = std::function<bool(Dictionary& all)>;
+  Result<Done, std::string> edit(std::string_view domain, std::string_view what, const Edit& edit);
+  // All keys of the domain.
+  Result<Dictionary, FileFailure> all(std::string_view domain);
 
  private:
   // Error lines, logged after the lock was released.
@@ -61,10 +70,11 @@ class FilePreferences final : public Preferences {
   Result<Dictionary, FileFailure> known(std::string_view domain, Complaints& complaints) REQUIRES(_mutex);
   Result<Dictionary, FileFailure> refused(const std::string& path, FileFailure failure, bool putAside,
                                           Complaints& complaints) REQUIRES(_mutex);
+  // Also stores when the text was made.
   bool store(std::string_view domain, std::string_view key, const Value& value, Complaints& complaints)
       REQUIRES(_mutex);
-  Result<Done, std::string> write(std::string_view domain, std::string_view key,
-                                  const std::optional<Value>& value, Complaints& complaints) REQUIRES(_mutex);
+  Result<Done, std::string> write(std::string_view domain, std::string_view what, const Edit& edit,
+                                  Complaints& complaints) REQUIRES(_mutex);
   std::string pathOf(std::string_view domain) const;
 
   FileStore& _files;

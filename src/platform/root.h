@@ -29,6 +29,8 @@ class Root {
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }
   std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }
+  std::string destinationsPath() const { return path("var/lib/veltrad/destinations.json"); }
+  std::string historyDirectory() const { return path("var/lib/veltrad/history"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }

@@ -2,12 +2,17 @@
 // Makes the back ends of a session and reads their states.
 #include "session/backend_set.h"
 
+#include <limits>
 #include <utility>
 
 #include "platform/log.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {
+
+namespace {
+constexpr double kNoVersion = std::numeric_limits<double>::quiet_NaN();
+}  // namespace
 
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
@@ -34,6 +39,12 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   facts.requireUserInfo = sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
   facts.batchEvents = sessionInfo->boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false);
   facts.account = making.account;
+  facts.client = backends::clientOf(facts);
+  const config::StorebagOrigin& origin = storebag->origin;
+  facts.storebag = std::make_shared<const Dictionary>(
+      Dictionary{{"name", origin.name},
+                 {"version", origin.version ? Value(*origin.version) : Value(kNoVersion)},
+                 {"section", origin.section}});
 
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   auto made = std::make_shared<BackendSet>();

@@ -7,9 +7,21 @@ namespace veltrad::session {
 bool HeardWord::hear() {
   const std::uint64_t turn = _gate.turn();
   if (turn == _heard) return false;
+  auto word = _gate.word();
+  _reset = word->resets != _word->resets;
   _heard = turn;
-  _word = _gate.word();
+  _word = std::move(word);
   return true;
+}
+
+void HeardWord::takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41],
+                             const BackendSet* set) const {
+  if (_reset) device.copyUniqueDeviceID(deviceID, sizeof deviceID);
+  const bool always = _word->policy->rules().consent == config::ConsentRule::always;
+  for (const auto& [name, backend] : set ? *set : BackendSet()) {
+    if (_reset) backend->takeIdentity(deviceID);
+    if (always) backend->rereadConsent();
+  }
 }
 
 backends::UserInfo HeardWord::allowed(backends::SharedDictionary userInfo) const {

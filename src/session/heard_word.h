@@ -8,6 +8,7 @@
 
 #include "backends/session_facts.h"
 #include "config/owner_gate.h"
+#include "session/backend_set.h"
 
 namespace veltrad::session {
 
@@ -19,6 +20,10 @@ class HeardWord {
   // True if there is another word than before, which is heard now.
   bool hear();
   const config::OwnersWord& now() const { return *_word; }
+  // If the word that was heard last came with other identifiers than the one before, reads the device's anew
+  // and has the back ends read theirs. These read consent again if the policy asks for it at any time. `set`
+  // may be null.
+  void takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41], const BackendSet* set) const;
   // With what of it may leave: null stays null, and what holds nothing that the owner keeps back the same
   // object.
   backends::UserInfo allowed(backends::SharedDictionary userInfo) const;
@@ -29,6 +34,7 @@ class HeardWord {
  private:
   const config::OwnerGate& _gate;
   std::uint64_t _heard = 0;
+  bool _reset = false;
   std::shared_ptr<const config::OwnersWord> _word = std::make_shared<const config::OwnersWord>();
 };
 

@@ -94,6 +94,7 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 void VeltradSession::hearOwner() {
   while (_word.hear()) {
     _fates.forget();
+    _word.takeIdentity(_services.device, _deviceid, _backends.get());
     _userInfo = _word.allowed(_userInfo.given);
     if (!_backends) continue;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
@@ -304,9 +305,10 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   hearOwner();
-  _word.restrict(logData);
-  const bool uploaded =
-      uploadLogDataArray(_backends.get(), logData, fates().taken(SessionFates::Item::logData));
+  const config::EditedFields edits = _word.restrict(logData);
+  backends::MessageNote note = fates().taken(SessionFates::Item::logData);
+  note.edits = &edits;
+  const bool uploaded = uploadLogDataArray(_backends.get(), logData, note);
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
 

@@ -71,24 +71,19 @@ class Deflation {
   }
   // Makes a used stream as good as new.
   bool beginAnew() { return deflateReset(&stream) == Z_OK; }
-  // Room for the output, which is kept too, up to a limit.
-  std::string& roomFor(std::size_t bytes) {
-    if (_room.size() < bytes) _room.resize(bytes);
-    return _room;
-  }
-  void limitRoom() {
-    if (_room.size() > kPieceBytes) _room = std::string();
-  }
   void give(const char* bytes, std::size_t count) {
     stream.next_in = reinterpret_cast<Bytef*>(const_cast<char*>(bytes));  // zlib only reads them
     stream.avail_in = static_cast<uInt>(count);
   }
-  // Writes to `room` and returns the result of deflate().
-  int run(int flush, std::string& room) {
-    stream.next_out = reinterpret_cast<Bytef*>(room.data());
-    stream.avail_out = static_cast<uInt>(room.size());
-    return deflate(&stream, flush);
+  void emptyRoom() {
+    stream.next_out = reinterpret_cast<Bytef*>(_room.get());
+    stream.avail_out = static_cast<uInt>(kPieceBytes);
   }
+  // Writes to what is left of the room and returns the result of deflate().
+  int run(int flush) { return deflate(&stream, flush); }
+  bool full() const { return stream.avail_out == 0; }
+  // What the room holds.
+  std::string_view made() const { return {_room.get(), kPieceBytes - stream.avail_out}; }
   void sayFailure(int result) const {
     logError("compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
              textOf(result, &FailureText::duringCompression), shown(stream.msg));
@@ -99,7 +94,8 @@ class Deflation {
 
  private:
   bool _begun = false;
-  std::string _room;
+  // Without initial content, which would touch every page.
+  const std::unique_ptr<char[]> _room{new char[kPieceBytes]};
 };
 
 namespace {
@@ -118,13 +114,13 @@ void sayCompressed(std::size_t from, std::size_t to) {
 }
 
 // Passes the output to `sink`.
-bool append(Deflation& deflation, int flush, std::string& room, const ByteSink& sink) {
+bool append(Deflation& deflation, int flush, const ByteSink& sink) {
   int result = Z_OK;
   do {
-    result = deflation.run(flush, room);
-    const std::size_t made = room.size() - deflation.stream.avail_out;
-    if (made > 0 && !sink(std::string_view(room).substr(0, made))) return false;
-  } while (result == Z_OK && deflation.stream.avail_out == 0);
+    deflation.emptyRoom();
+    result = deflation.run(flush);
+    if (!deflation.made().empty() && !sink(deflation.made())) return false;
+  } while (result == Z_OK && deflation.full());
   const bool nothingToDo = result == Z_BUF_ERROR && flush != Z_FINISH;
   if (result == Z_OK || result == Z_STREAM_END || nothingToDo) return true;
   deflation.sayFailure(result);
@@ -134,7 +130,7 @@ bool append(Deflation& deflation, int flush, std::string& room, const ByteSink& 
 bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
   Deflation deflation(Z_DEFAULT_COMPRESSION);
   if (!deflation.begin()) return false;
-  std::string piece(kPieceBytes, '\0'), room(kPieceBytes, '\0');
+  std::string piece(kPieceBytes, '\0');
   std::size_t taken = 0;
   std::optional<std::size_t> count;
   do {
@@ -146,7 +142,7 @@ bool deflatePieces(const ByteSource& source, const ByteSink& sink) {
       return false;
     }
     deflation.give(piece.data(), *count);
-    if (!append(deflation, *count == 0 ? Z_FINISH : Z_NO_FLUSH, room, sink)) return false;
+    if (!append(deflation, *count == 0 ? Z_FINISH : Z_NO_FLUSH, sink)) return false;
   } while (*count > 0);
   sayCompressed(taken, deflation.stream.total_out);
   return true;
@@ -163,7 +159,8 @@ void GzipCompressor::rest() {
   kept.swap(_kept);
 }
 
-std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes, int level) {
+std::optional<std::string> GzipCompressor::deflateAtOnce(const std::vector<std::string_view>& pieces,
+                                                         int level) {
   std::unique_ptr<Deflation> taken;
   {
     const Lock held(_mutex);
@@ -174,34 +171,43 @@ std::optional<std::string> GzipCompressor::deflateAtOnce(std::string_view bytes,
     if (!taken->begin()) return std::nullopt;
   }
   Deflation& deflation = *taken;
-  deflation.give(bytes.data(), bytes.size());
-  std::string& room = deflation.roomFor(deflateBound(&deflation.stream, bytes.size()));
-  int result = deflation.run(Z_FINISH, room);
-  if (result == Z_OK) result = deflate(&deflation.stream, Z_FINISH);  // fails, since no room is left
-  if (result != Z_STREAM_END) {
+  std::string output;
+  deflation.emptyRoom();
+  for (std::size_t i = 0; i < pieces.size(); ++i) {
+    const bool last = i + 1 == pieces.size();
+    deflation.give(pieces[i].data(), pieces[i].size());
+    int result = deflation.run(last ? Z_FINISH : Z_NO_FLUSH);
+    for (; result == Z_OK && deflation.full(); result = deflation.run(last ? Z_FINISH : Z_NO_FLUSH)) {
+      output.append(deflation.made());
+      deflation.emptyRoom();
+    }
+    const bool nothingToDo = result == Z_BUF_ERROR && !last;
+    if (result == Z_STREAM_END || (result == Z_OK && !last) || nothingToDo) continue;
     deflation.sayFailure(result);
     return std::nullopt;
   }
-  // A copy of exactly its length, because it may wait for a server for a long time.
-  std::string output(room.data(), deflation.stream.total_out);
-  deflation.limitRoom();
-  sayCompressed(bytes.size(), output.size());
+  output.append(deflation.made());
+  output.shrink_to_fit();  // it may wait for a server for a long time
+  sayCompressed(deflation.stream.total_in, output.size());
   const Lock held(_mutex);
   _kept.swap(taken);
   return output;
 }
 
-std::optional<std::string> GzipCompressor::gzipDeflate(std::string_view bytes, int level) {
-  if (bytes.empty()) {
+std::optional<std::string> GzipCompressor::gzipDeflate(const std::vector<std::string_view>& pieces,
+                                                       int level) {
+  std::size_t bytes = 0;
+  for (const std::string_view piece : pieces) bytes += piece.size();
+  if (bytes == 0) {
     sayEmpty();
     return std::nullopt;
   }
-  if (bytes.size() > kMostAtOnce) {
-    logError("compressDataWithZlibOrGzip: Cannot compress %zu bytes: at most %zu", bytes.size(), kMostAtOnce);
+  if (bytes > kMostAtOnce) {
+    logError("compressDataWithZlibOrGzip: Cannot compress %zu bytes: at most %zu", bytes, kMostAtOnce);
     return std::nullopt;
   }
   try {
-    return deflateAtOnce(bytes, level);
+    return deflateAtOnce(pieces, level);
   } catch (const std::bad_alloc&) {
     sayNoMemory();
     return std::nullopt;

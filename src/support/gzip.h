@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/mutex.h"
 
@@ -15,21 +16,22 @@ namespace veltrad::support {
 
 class Deflation;
 
-// Compresses texts. Keeps one stream of zlib (some 270 KB) and up to 128 KiB of room for its output between
-// them, because memory that is taken from the system and returned for each text costs dozens of page faults.
-// Any thread.
+// Compresses texts. Keeps one stream of zlib (some 270 KB) and the part of 128 KiB of room for its output
+// that was ever used, because memory that is taken from the system and returned for each text costs dozens of
+// page faults. Any thread.
 class GzipCompressor {
  public:
   GzipCompressor();
   ~GzipCompressor();
 
-  // `level`: zlib's, 1 (fast) to 9 (small). Absent if there are no bytes, memory is short or zlib fails.
-  std::optional<std::string> gzipDeflate(std::string_view bytes, int level);
+  // Compresses the pieces as one text. `level`: zlib's, 1 (fast) to 9 (small). Absent if there are no bytes,
+  // memory is short or zlib fails.
+  std::optional<std::string> gzipDeflate(const std::vector<std::string_view>& pieces, int level);
   // Frees the stream until the next text.
   void rest();
 
  private:
-  std::optional<std::string> deflateAtOnce(std::string_view bytes, int level);
+  std::optional<std::string> deflateAtOnce(const std::vector<std::string_view>& pieces, int level);
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::unique_ptr<Deflation> _kept GUARDED_BY(_mutex);

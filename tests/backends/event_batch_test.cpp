@@ -10,13 +10,8 @@
 namespace veltrad {
 namespace {
 
-Dictionary event(int number) {
-  return {{"_sessionID", "old"}, {"number", number}};
-}
-std::size_t charged(const std::vector<Dictionary>& events) {
-  std::size_t sum = 0;
-  for (const Dictionary& one : events) sum += backends::sizeOfEvent(one).charged;
-  return sum;
+backends::EventText event(int number, const std::string& sessionID = "old") {
+  return backends::eventText({{"_sessionID", sessionID}, {"number", number}});
 }
 
 TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
@@ -24,7 +19,7 @@ TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
   const backends::EventSize half{backends::EventBatch::kMostBytes / 2, 10};
   EXPECT_FALSE(batch.full({backends::EventBatch::kMostBytes, 0}));
   EXPECT_TRUE(batch.full({backends::EventBatch::kMostBytes + 1, 0}));
-  batch.add(5, event(0), half, 7);
+  batch.add(5, {event(0), half, 7});
   EXPECT_FALSE(batch.full(half));
   EXPECT_TRUE(batch.full({half.json + 1, 0}));
   batch.dropOldest();
@@ -33,7 +28,7 @@ TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
   const backends::EventSize small = backends::sizeOfEvent(event(1));
   for (std::size_t i = 0; i < backends::EventBatch::kMostEvents; ++i) {
     ASSERT_FALSE(batch.full(small));
-    batch.add(i % 2 == 0 ? 5 : 6, event(1), small, i);
+    batch.add(i % 2 == 0 ? 5 : 6, {event(1), small, i});
   }
   EXPECT_TRUE(batch.full({}));
   EXPECT_TRUE(batch.thresholdReached(5, 2048) && !batch.thresholdReached(5, 2049));  // one was dropped
@@ -47,12 +42,13 @@ TEST(EventBatch, IsFullAtItsBoundsAndReachesThresholdsByMethod) {
   const std::size_t sum = batch.chargedBytes();
   batch.discard();
   EXPECT_TRUE(batch.thresholdReached(6, 2047) && batch.chargedBytes() == 0);
-  batch.add(6, event(2), small, 9);
-  EXPECT_EQ(batch.take(), std::vector{event(2)});
+  batch.add(6, {event(2), small, 9, true});
+  batch.unsettle();
+  const auto taken = batch.take();
+  EXPECT_TRUE(taken.size() == 1 && taken[0].text == event(2) && !taken[0].settled);
   EXPECT_TRUE(!batch.thresholdReached(6, 0) && batch.size() == 0 && !batch.oldestTurn());
-  Dictionary renamed = event(1);
-  renamed.set("_sessionID", "a much longer one than before");
-  EXPECT_EQ(sum, charged(std::vector(backends::EventBatch::kMostEvents - 1, renamed)));
+  const auto renamed = backends::sizeOfEvent(event(1, "a much longer one than before"));
+  EXPECT_EQ(sum, (backends::EventBatch::kMostEvents - 1) * renamed.charged);
 }
 
 TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
@@ -67,32 +63,33 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   const auto add = [&](int number, std::uint64_t built) {
     auto charge = account->keep(size.charged);
     ASSERT_TRUE(charge);
-    held->add(5, event(number), size, std::move(*charge), account->nextTurn(), built, wire::Step::batched,
+    held->add(5, {event(number), size, account->nextTurn()}, std::move(*charge), built, wire::Step::batched,
               {});
   };
   const auto built = held->sessionIDChanges();
   for (int number : {1, 2, 3, 4}) add(number, built);  // the first makes room for the fourth
   EXPECT_EQ(counters.value(wire::Reason::event_over_share), 1u);
   EXPECT_EQ(account->used(), 3 * size.charged);
-  held->setSessionID(std::string(size.charged / 32, 'n'));  // longer ones keep more: not all of them fit
+  held->setSessionID(std::string(size.charged / 6, 'n'));  // longer ones keep more: not all of them fit
   EXPECT_EQ(counters.value(wire::Reason::event_over_share), 2u);
   EXPECT_LE(account->used(), bounds.userKept);
   held->setSessionID("new");
   add(5, built);  // built before, added after
   auto taken = held->take();
   EXPECT_EQ(taken.charge.bytes(), account->used());
-  EXPECT_EQ(account->used(), charged(taken.events));
-  std::string numbers;
-  for (const Dictionary& one : taken.events)
-    numbers += std::to_string(*one.uint32("number")) + *one.string("_sessionID") + " ";
-  EXPECT_EQ(numbers, "3new 4new 5new ");
+  std::size_t charged = 0;
+  for (int number = 3; const auto& one : taken.events) {
+    EXPECT_EQ(one.text, event(number++, "new"));
+    charged += backends::sizeOfEvent(one.text).charged;
+  }
+  EXPECT_TRUE(taken.events.size() == 3 && account->used() == charged);
   taken.charge.release();
   add(6, held->sessionIDChanges());
   EXPECT_EQ(held->needOf(5, 0, size), backends::HeldEvents::Need::flush);
   EXPECT_EQ(held->needOf(5, 1, size), backends::HeldEvents::Need::room);
   EXPECT_EQ(held->needOf(5, 1, {backends::EventBatch::kMostBytes, 0}), backends::HeldEvents::Need::bound);
-  held->add(5, event(7), {backends::EventBatch::kMostBytes, size.charged}, *account->keep(size.charged), 9, 2,
-            wire::Step::batched, {});
+  held->add(5, {event(7), {backends::EventBatch::kMostBytes, size.charged}, 9}, *account->keep(size.charged),
+            2, wire::Step::batched, {});
   EXPECT_EQ(counters.value(wire::Reason::batch_full), 1u);
   held->discard(wire::Reason::refused_by_owner);
   EXPECT_EQ(counters.value(wire::Reason::refused_by_owner), 1u);

@@ -10,8 +10,10 @@
 
 #include "config/daily_allowance.h"
 #include "config/field_rules.h"
+#include "config/owner_gate.h"
 #include "configuration.h"
 #include "formats/json.h"
+#include "platform/device_secret.h"
 
 namespace veltrad {
 namespace {
@@ -149,6 +151,35 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
     fresh.load();
     EXPECT_TRUE(fresh.take(both, 9, 120)) << text;
   }
+}
+
+TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
+  const ExpectedLog log({});
+  Owner owner;
+  FakeClock clock;
+  FakePreferences preferences;
+  platform::DeviceSecret secret(owner.files, "/secret");
+  config::DailyAllowance day(owner.files, clock, "/daily");
+  config::OwnerGate gate(owner.policy, preferences, secret, day);
+  EXPECT_TRUE(gate.refresh());
+  const auto sent = [&gate] {
+    Dictionary message{{"kept", 1}, {"number", "0170"}, {"secret", 2}};
+    config::EditedFields changes;
+    if (const auto& fields = gate.word()->fields) fields->apply(message, changes);
+    return message;
+  };
+  owner.files.failReads("/secret", platform::FileFailure::Kind::shortage);
+  owner.says(R"({"remove": ["secret"]})");
+  EXPECT_TRUE(gate.refresh());
+  EXPECT_EQ(sent(), (Dictionary{{"kept", 1}, {"number", "0170"}}));
+  owner.says(R"({"reporting": "off", "remove": ["secret"], "hash": ["number"]})");
+  EXPECT_TRUE(gate.refresh());
+  EXPECT_FALSE(gate.refresh());
+  EXPECT_EQ(gate.word()->refusal, policy_reporting);
+  EXPECT_EQ(sent(), (Dictionary{{"kept", 1}}));  // what cannot be hashed yet is removed
+  owner.files.failReads("/secret", std::nullopt);
+  EXPECT_TRUE(gate.refresh());
+  EXPECT_EQ(sent().string("number")->size(), 64u);
 }
 
 TEST(FieldRules, RemoveAndHashAtAnyDepth) {

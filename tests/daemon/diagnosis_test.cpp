@@ -72,7 +72,7 @@ TEST(Diagnosis, NamesWhatIsWrongAndNothingElse) {
       {[](Facts& facts) { facts.machine.consent = daemon::Consent::policyBroken; }, "consent", "failure",
        "policy.json"},
       {[](Facts& facts) { facts.machine.consent = daemon::Consent::reportingOff; }, "consent", "warning",
-       "ReportingOff"},
+       "veltractl privacy on"},
       {[](Facts& facts) { facts.machine.sandboxInForce = false; }, "sandbox", "warning", "Landlock"},
       {[](Facts& facts) { facts.machine.now = 86'400; }, "clock", "failure", "timedatectl"}};
   for (const auto& [broken, name, result, word] : table) {

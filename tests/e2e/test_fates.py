@@ -70,17 +70,17 @@ class Fates(FatesTest):
             session = self.client(requireUserInfo=True)
             watch = Process([program("veltractl"), "watch", "--json", "--category", "7"], self.root.environment(), "stdout")
             self.addCleanup(watch.kill)
-            told = []
-
-            def posted():
+            def told():
+                """The steps of a message that was told of and answered."""
                 session.message(category=7)
-                told[:] = [json.loads(line) for line in watch.text]
-                return any(line.get("step") == "answered" for line in told)
-            wait_until(posted, "a message and its answer")
-            first = told[0]
-            self.assertEqual((first["event"], first["client"], "backends" in first), ("message", "phone", False))
-            self.assertEqual([line["step"] for line in told if line["event"] == "step" and line["message"] == first["message"]],
-                             ["posted", "answered"])
+                lines = [json.loads(line) for line in watch.text]
+                for first in (line for line in lines if line["event"] == "message"):
+                    self.assertEqual((first["client"], "backends" in first), ("phone", False))
+                    steps = [line["step"] for line in lines if line["event"] == "step" and line["message"] == first["message"]]
+                    if "answered" in steps:
+                        return steps
+                return None
+            self.assertEqual(wait_until(told, "a message and its answer"), ["posted", "answered"])
             watch.popen.send_signal(signal.SIGTERM)
             self.assertEqual(watch.end(), 0)
 
@@ -221,7 +221,7 @@ class RandomFates(FatesTest):
                 about = (name, backend, line)
                 self.assertTrue(fate != "dropped" or backend["fateReason"], about)
                 if name in HTTPS:
-                    names = ("clientName", ) if line["from"] == "oneShot" else ("clientName", "serviceName")
+                    names = [key + "Name" for key in ("client", "service") if line[key]]
                     self.compare_event(events.pop((name, given["n"]), None), given, names, backend, about)
                 elif name == "dashboard":
                     came = datagrams.get((line["sessionID"], line["category"], backend["eventNumber"]), [])

@@ -210,18 +210,21 @@ class Events(HTTPSTest):
             self.assertEqual([e["number"] for text in (flushed, alone) for e in json.loads(text)["events"]], [3, 4])
             self.assertEqual(client.flush(), (None, -1, "Nothing to flush"))
             client.message(number=5)
+            client.states(clientName="phone", serviceName="phone", room="new")  # is merged into what waits, too
+            client.message(number=6)
             reply, *error = client.flush()
-            self.assertEqual(([e["number"] for e in json.loads(reply)["events"]], error), ([5], [None, None]))
+            self.assertEqual(([(e["number"], e["room"]) for e in json.loads(reply)["events"]], error),
+                             ([(5, "new"), (6, "new")], [None, None]))
             slow, fast = self.client("slow"), self.client("fast", batchEvent=True)
             self.assertEqual((slow.message(), fast.event()["_eventNumber"]), (None, 2))
             for each in (client, slow, fast):
                 each.close()
             sizes = {name: sorted(len(post["body"]["events"]) for post in self.posts(name, count))
                      for name, count in (("phone", 4), ("urgent", 1), ("slow", 1), ("fast", 3))}
-        self.assertEqual(sizes, {"phone": [1, 1, 1, 4], "urgent": [1], "slow": [3], "fast": [1, 1, 1]})
+        self.assertEqual(sizes, {"phone": [1, 1, 2, 4], "urgent": [1], "slow": [3], "fast": [1, 1, 1]})
         self.assertEqual([{post["headers"].get("X-VLT-Event-Map") for post in self.posts(name)}
                           for name in ("phone", "slow", "urgent")], [{None}, {None}, {"5 2"}])
-        self.assertEqual(self.counts()["event posted"], 14)
+        self.assertEqual(self.counts()["event posted"], 15)
 
     def test_sampled_out_messages_are_held_until_one_overrides_it(self):
         self.serve(entry(sampling_threshold=-1, override_sampling=0.5))

@@ -2,6 +2,8 @@
 """What the owner of the device says in policy.json, on open sessions and before anything leaves."""
 import hmac
 import json
+import socket
+import threading
 import time
 
 from harness import wait_until
@@ -14,7 +16,7 @@ BACKENDS = ["ampery", "dashboard", "httppost", "uploadserver"]
 WHO = {"clientName": "phone", "serviceName": "phone"}
 
 
-class Policy(HTTPSTest):
+class PolicyTest(HTTPSTest):
     def setUp(self):
         super().setUp()
         for name in ("quindle", "ostvane"):
@@ -36,6 +38,11 @@ class Policy(HTTPSTest):
     def arrived(self):
         return [len(self.lab.received(kind)) for kind in ("events", "dashboard", "uploads", "logdata")]
 
+    def status(self):
+        return json.loads(self.ctl("status", "--json")[0])
+
+
+class Policy(PolicyTest):
     def test_reporting_off_stops_open_sessions_within_a_second_and_on_lets_them_go_on(self):
         self.lab.control(path="/dashboard", ack="drop")
         with self.serving() as daemon:
@@ -101,7 +108,7 @@ class Policy(HTTPSTest):
         self.lab.put("quindle", {"version": "v", "development": {
             "httppost": {"clients": [entry()]}, "ampery": {},
             "dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}", "post_url": "${url}/logdata"}}})
-        self.say(remove=["SECRET", "serviceName"], hash=["number"])
+        self.say(remove=["SECRET", "serviceName"], hash=["number"], history={})
         with self.serving("unable to handle key: deep") as daemon:
             session = self.client("phone", user_info={"serviceName": "hidden-service", "number": "hidden-info"})
             session.message(secret="hidden-text", number="hidden-number", deep={"list": [{"Secret": "hidden-deep"}]}, kept=1)
@@ -109,15 +116,77 @@ class Policy(HTTPSTest):
             event = self.lab.wait_for_events(1, kept=1)[0]
             self.lab.received("dashboard", 2)
             session.ask("flushMessagesWithCompletion:")
+            items = [json.loads(line) for line in self.ctl("history", "--json")[0].splitlines()]
+            shown = "".join(self.ctl("history", "show", item["id"])[0] for item in items)
+        self.assertEqual({name for item in items for name in item["removed"]}, {"secret", "Secret", "serviceName"})
+        self.assertEqual({name for item in items for name in item["hashed"]}, {"number"})
         secret = (self.root.path / "var/lib/veltrad/secret").read_bytes()
         digest = {text: hmac.new(secret, text.encode(), "sha256").hexdigest() for text in ("hidden-info", "hidden-number")}
         self.assertEqual(event["number"], digest["hidden-info"])
         self.assertNotIn("secret", event)
-        seen = json.dumps([self.lab.received(kind) for kind in ("events", "dashboard", "logdata")]) + "\n".join(daemon.text)
+        seen = json.dumps([self.lab.received(kind) for kind in ("events", "dashboard", "logdata")]) + "\n".join(daemon.text) + shown
         logs = [path for path in self.root.path.rglob("*") if path.is_file() and "etc" not in path.parts]
         for text in [seen, *(path.read_bytes().decode("latin-1") for path in logs)]:
             self.assertNotIn("hidden", text)
+        self.assertIn(digest["hidden-number"], shown)
         self.assertIn(digest["hidden-number"], (self.root.path / "var/log/veltrad/energy.jsonl").read_text())
+
+    def test_closed_gates_bring_not_one_packet_to_any_server_but_the_storebags(self):
+        gates = (({"consent": "always"}, False), ({"reporting": "off"}, True), ({"hosts": ["localhost"]}, True))
+        for rules, consent in gates:
+            with socket.create_server(("127.0.0.1", 0)) as server, socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as dashboard:
+                dashboard.bind(("127.0.0.1", 0))
+                url = f"https://127.0.0.1:{server.getsockname()[1]}"
+                self.lab.put("quindle", {"version": "v", "release": {
+                    "httppost": {"clients": [entry(client=None, override_dnu=1, post_url=url, realtime_post_url=url)]},
+                    "dashboard": {"ip": "127.0.0.1", "port": dashboard.getsockname()[1], "post_url": url, "reliable": 50},
+                    "uploadserver": {"post_url": url}, "ampery": {}}})
+                self.say(**rules)
+                self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
+                with self.serving("without requiring it", "user info provided", "stays: the owner", "upload failed", "Only upload"):
+                    for required in (False, True):
+                        session = self.client(requireUserInfo=required, batchEvent=required)
+                        for flag in range(4):
+                            session.message(number=1, flag=flag)
+                        session.flush()
+                        session.states(clientName="other", serviceName="other")
+                        session.ask(UPLOAD_LOG, data=[1])
+                    self.ctl("one-shot", "--client-type", "7", "--session-id", "9", "--category", "5", "--type", "1", "a=b")
+                    log = self.root.path / "some.log"
+                    log.write_text("x")
+                    self.ctl("upload", "--client-type", "7", "--session-id", "9", str(log), status=1)
+                for watched in (server, dashboard):
+                    watched.setblocking(False)
+                with self.assertRaises(BlockingIOError, msg=rules):
+                    server.accept()
+                with self.assertRaises(BlockingIOError, msg=rules):
+                    dashboard.recv(2000)
+            self.assertTrue(self.lab.received("storebags"))
+
+    def test_a_withdrawal_under_load_stops_the_last_packet_within_a_second(self):
+        self.say(consent="always")
+        # A post that had not begun when the consent was withdrawn.
+        with self.serving("The owner of the device does not let it leave (policy_consent)"):
+            clients = [self.client(batchEvent=batched) for batched in (False, False, True)]
+            stop = threading.Event()
+
+            def load(client):
+                while not stop.is_set():
+                    client.message(text="x" * 200)
+                    client.flush()
+            threads = [threading.Thread(target=load, args=(client,)) for client in clients]
+            for thread in threads:
+                thread.start()
+            self.lab.received("events", 100)
+            withdrawn = time.time()
+            self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+            wait_until(lambda: time.time() > withdrawn + 1.5, "what may still come")
+            stop.set()
+            for thread in threads:
+                thread.join()
+        for kind in ("events", "dashboard"):
+            last = max(line["time"] for line in self.lab.received(kind))
+            self.assertLess(last, withdrawn + 1, kind)
 
     def test_a_broken_policy_closes_everything_and_says_where(self):
         with self.serving("Policy could not be read") as daemon:

@@ -1,6 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
 """Compiles each file unchanged, which must succeed, and with a fault, which must fail with the given error. Also checks that
 every lock has a rank, because the compiler would accept a lock without one in any order."""
+import os
 import re
 import subprocess
 import sys
@@ -8,7 +9,7 @@ from pathlib import Path
 
 HERE = Path(__file__).resolve().parent
 SOURCES = HERE.parent.parent / "src"
-ROOMS = HERE.parent.parent / "build" / "dev" / "rooms"
+ROOMS = HERE.parent.parent / os.environ.get("VELTRA_BUILD", "build/dev") / "rooms"
 LOCKS = ["-I", str(SOURCES), "-Wthread-safety", "-Wthread-safety-beta", "-Werror"]
 CONFIG = [word for room in ("config", "support", "wire", "platform", "base") for word in ("-I", str(ROOMS / room))]
 # File, compiler flags, and the text that the error must contain; None: it must compile.

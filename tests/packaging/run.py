@@ -4,6 +4,7 @@
 section to a first message, tries what the units forbid, upgrades over a running daemon with a client, removes and purges.
 Needs root, cgroup v2 and minutes; fewer with a directory as argument that debootstrap has made before, which is copied. The last
 line is "N passed, N failed"."""
+import json
 import os
 import plistlib
 import re
@@ -126,6 +127,7 @@ class Test:
         expected = {"/etc/veltrad": "755 root:root", "/var/lib/veltrad": "750 veltrad:veltrad",
                     "/var/log/veltrad": "750 veltrad:veltrad",
                     "/var/mobile/Library/Logs/Zentrel/Retired": "750 veltrad:veltrad",
+                    "/etc/veltrad/policy.json": "644 root:root",
                     "/run/veltrad/com.florn.veltrad.sock": "666 root:root"}
         found = self.box.run(f"stat -c '%n %a %U:%G' {' '.join(expected)}").splitlines()
         assert found == [f"{path} {rights}" for path, rights in expected.items()], found
@@ -137,10 +139,17 @@ class Test:
     def test_first_message_by_the_readme(self):
         section = re.search(r"^## Install\n(.*?)^## ", (SOURCE / "README.md").read_text(), re.M | re.S)[1]
         set_up, report = re.findall(r"^```sh\n(.*?)^```$", section, re.M | re.S)[-2:]
-        self.box.run(set_up)
+        consent = "veltractl config set DiagnosticLogSubmissionEnabled true"
+        self.box.run(set_up.replace(consent + "\n", ""))
+        doctor = json.loads(self.box.run("veltractl doctor --client-type 7 --json", check=False))
+        assert consent in next(check["mend"] for check in doctor["checks"] if check["name"] == "consent"), doctor
+        assert "policy_consent" in self.box.run("veltractl send --client-type 7 --category 5 --type 1", check=False)
+        assert consent in set_up
+        self.box.run(consent)
         self.box.run(report)
         self.received('"_method":5')
         assert "User=veltrad" in self.box.run("systemctl show -p User veltrad")
+        assert '"kind":"post"' in self.box.run("veltractl history --json")
         stats = "veltractl stats --json"  # which everybody may read
         wait_until(lambda: "message taken in" in self.box.run(stats, check=False, user="nobody"), "the counters")
 

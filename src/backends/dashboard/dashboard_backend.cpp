@@ -59,7 +59,6 @@ struct Server {
     char text[INET_ADDRSTRLEN] = {};
     return inet_ntop(AF_INET, &address->sin_addr, text, sizeof text);
   }
-  std::string url() const { return "udp://" + host() + ":" + std::to_string(ntohs(address->sin_port)); }
   DashboardQueues::Route routeOf(const platform::MemoryAccount* account) const {
     return {address->sin_addr.s_addr, address->sin_port, reliable, period, DashboardQueues::userOf(account)};
   }
@@ -92,10 +91,15 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
     logError("DashboardBackend(initWithName): can't create timer source.");
     return nullptr;
   }
-  const NetworkProcQueue::Kind kind{reliable,      making.oneShot,
-                                    server.period, server.host(),
-                                    making.gate,   {making.fates, wire::kVeltraBackendDashboard},
-                                    server.url()};
+  const std::string host = server.host();
+  const std::string to = "udp://" + host + ":" + std::to_string(ntohs(server.address->sin_port));
+  const NetworkProcQueue::Kind kind{reliable,
+                                    making.oneShot,
+                                    server.period,
+                                    host,
+                                    to,
+                                    making.gate,
+                                    {making.fates, wire::kVeltraBackendDashboard}};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
@@ -152,7 +156,15 @@ DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::str
       _clock(making.clock),
       _counters(making.counters),
       _usingProfile(profile != nullptr),
-      _postURL(profile ? profile->postURL : std::nullopt) {}
+      _postURL(profile ? profile->postURL : std::nullopt),
+      _gate(making.gate) {}
+
+DatagramOwner DashboardBackend::owner(const MessageNote& note) const {
+  const auto facts = this->facts();
+  if (!_gate || !_gate->keepsRecords()) return {facts->client, {}};
+  return {facts->client,
+          aboutDeparture(name(), *facts, std::nullopt, note.edits ? *note.edits : config::EditedFields())};
+}
 
 std::vector<std::string> DashboardBackend::hosts() const {
   return {_networkProcQueue->host()};
@@ -182,9 +194,10 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   std::string line = writeLocalLog(packet);
   const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
   wire::StepEntry fate = stepOf(message);
-  fate.text = pen().textOf(_networkProcQueue->url());
+  fate.text = pen().textOf(_networkProcQueue->address());
   fate.bytes = static_cast<std::uint32_t>(length);
-  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, fate), std::move(line)};
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note), fate),
+          std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
@@ -217,7 +230,7 @@ bool DashboardBackend::uploadLogData(const Array& logData, const MessageNote& no
     pen().write(wire::Step::dropped, wire::Reason::log_data_refused_by_owner, fate);
     return false;
   }
-  const auto location = _uploads.upload(_postURL, logData, pen(), fate);
+  const auto location = _uploads.upload(_postURL, logData, owner(note), pen(), fate);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
   const platform::TimeValue now = _clock.now();

@@ -60,6 +60,8 @@ class DashboardBackend final : public VeltraBackend {
   bool uploadLogData(const Array& logData, const MessageNote& note) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;
+  // Datagrams with the identifier before do not go on.
+  void dropIdentified() override { dropWaiting(); }
 
  private:
   void dropWaiting() override;
@@ -69,12 +71,14 @@ class DashboardBackend final : public VeltraBackend {
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
   MessageNote notedMessage(platform::TimeValue now, wire::FateRef session) const;
+  DatagramOwner owner(const MessageNote& note) const;
 
   LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
   const bool _usingProfile;
   const std::optional<std::string> _postURL;
+  config::OwnerGate* const _gate;
   std::shared_ptr<NetworkProcQueue> _networkProcQueue;
 
   // The session's thread only.

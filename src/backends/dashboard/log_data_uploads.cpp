@@ -25,8 +25,8 @@ std::optional<std::string> archiveOf(const Array& logData) {
 }  // namespace
 
 std::optional<std::string> LogDataUploads::upload(const std::optional<std::string>& postURL,
-                                                  const Array& logData, const platform::FatePen& pen,
-                                                  wire::StepEntry fate) {
+                                                  const Array& logData, const DatagramOwner& owner,
+                                                  const platform::FatePen& pen, wire::StepEntry fate) {
   const auto refused = [&](wire::Reason why) {
     _counters.count(why);
     pen.write(wire::Step::dropped, why, fate);
@@ -46,7 +46,7 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
   fate.bytes = static_cast<std::uint32_t>(archive->size());
   fate.events = 1;
   pen.write(wire::Step::posted, std::nullopt, fate);
-  const http::HTTPResult answer = post(*postURL, std::move(*archive));
+  const http::HTTPResult answer = post(*postURL, std::move(*archive), owner);
   const bool located = answer && !answer.value().body.empty();
   const wire::Reason end = located  ? wire::Reason::log_data_uploaded
                            : answer ? wire::Reason::log_data_no_place
@@ -66,13 +66,16 @@ std::optional<std::string> LogDataUploads::upload(const std::optional<std::strin
   return location;
 }
 
-http::HTTPResult LogDataUploads::post(const std::string& url, std::string archive) {
+http::HTTPResult LogDataUploads::post(const std::string& url, std::string archive,
+                                      const DatagramOwner& owner) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::logData;
   request.url = url;
   request.headers = {{"Content-Type", "application/octet-stream"}};
   request.body = std::move(archive);
+  request.client = owner.client;
+  request.about = owner.about;
   request.mostResponseBytes = kMostLogAnswerBytes;
   return _http.perform(std::move(request));
 }

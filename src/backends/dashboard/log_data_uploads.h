@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 
+#include "backends/dashboard/udp_packet_to_send.h"
 #include "base/value.h"
 #include "http/http_client.h"
 #include "platform/counters.h"
@@ -22,10 +23,11 @@ class LogDataUploads {
   // is no answer or it is empty.
   // What becomes of it is also written with the pen; `fate` says of which upload.
   std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData,
-                                    const platform::FatePen& pen, wire::StepEntry fate);
+                                    const DatagramOwner& owner, const platform::FatePen& pen,
+                                    wire::StepEntry fate);
 
  private:
-  http::HTTPResult post(const std::string& url, std::string archive);
+  http::HTTPResult post(const std::string& url, std::string archive, const DatagramOwner& owner);
 
   http::HTTPClient& _http;
   platform::Counters& _counters;

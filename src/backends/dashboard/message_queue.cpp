@@ -13,30 +13,40 @@ constexpr int checksBeforeRetransmit[] = {2, 3, 5, 9};
 constexpr int kMostRetransmits = static_cast<int>(std::size(checksBeforeRetransmit));
 static_assert(checksBeforeRetransmit[kMostRetransmits - 1] == SentCopies::kTicks);
 // Room for five transmissions of each datagram that waits, and as many of those that no longer do.
+constexpr const char* kNotAcknowledged = "not acknowledged";
+constexpr const char* kNoMemory = "no memory to await its acknowledgement";
 constexpr std::size_t kMostCopies = MessageQueue::maxPendingSharedPackets * 2 * (kMostRetransmits + 1);
 }  // namespace
 
-MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Tell tell)
+MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder recorder, Tell tell)
     : _reliableUDP(reliableUDP),
       _most(shared ? maxPendingSharedPackets : maxPendingPackets),
       _send(std::move(send)),
+      _recorder(std::move(recorder)),
       _tell(std::move(tell)) {
   if (shared) _copies.emplace(kMostCopies);
 }
 
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                                                std::optional<platform::Charge> charge,
-                                               std::uint64_t message) {
+                                               const DatagramOwner& owner, std::uint64_t message) {
   const bool sent = _send(datagram);
+  const std::uint64_t record = sent ? recordSent(datagram, owner) : 0;
   First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt, 0, false};
-  if (sent && !_reliableUDP) return result;
+  const bool waits = !sent || _reliableUDP;
+  if (sent && _recorder.ended && (!waits || !charge))
+    _recorder.ended(record, datagram.size(), 1, waits ? kNoMemory : "");
+  if (!waits) return result;
   if (!charge)
     return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt, 0,
             false};
   const auto state = sent ? UDPPacketToSend::awaitsAcknowledgement : UDPPacketToSend::notSent;
   _pending.push_back({std::string(datagram), eventNumber, ++_lastSerial, std::move(*charge), message, state});
+  _pending.back().owner = owner;
+  _pending.back().record = record;
   if (sent && _copies) _copies->sent(_lastSerial, eventNumber);
   if (_pending.size() > _most) {
+    recordEnd(_pending.front(), kNotAcknowledged);
     result.pushedOutMessage = _pending.front().message;
     result.pushedOutSent = _pending.front().state == UDPPacketToSend::awaitsAcknowledgement;
     _pending.pop_front();
@@ -66,6 +76,8 @@ bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   ++result.sent;
   _tell(record.message, wire::Step::sent, wire::Reason::datagram_sent);
   record.state = UDPPacketToSend::awaitsAcknowledgement;
+  record.record = recordSent(record.data, record.owner);
+  if (!_reliableUDP) recordEnd(record, "");
   return !_reliableUDP;
 }
 
@@ -73,6 +85,7 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   if (record.numberOfRetransmits >= kMostRetransmits) {
     ++result.givenUp;
     _tell(record.message, wire::Step::given_up, wire::Reason::never_acknowledged);
+    recordEnd(record, kNotAcknowledged);
     return true;
   }
   const int checks = record.numberOfChecks + 1;
@@ -85,6 +98,23 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
     _tell(record.message, wire::Step::again, wire::Reason::datagram_sent_again);
   }
   return false;
+}
+
+void MessageQueue::clear(const std::function<void(const UDPPacketToSend&)>& drop) {
+  for (const UDPPacketToSend& record : _pending) {
+    recordEnd(record, kNotAcknowledged);
+    if (drop) drop(record);
+  }
+  _pending.clear();
+}
+
+std::uint64_t MessageQueue::recordSent(std::string_view datagram, const DatagramOwner& owner) const {
+  return _recorder.sent ? _recorder.sent(datagram, owner) : 0;
+}
+
+void MessageQueue::recordEnd(const UDPPacketToSend& record, const char* error) const {
+  if (_recorder.ended && record.state != UDPPacketToSend::notSent)
+    _recorder.ended(record.record, record.data.size(), record.transmissions(), error);
 }
 
 std::size_t MessageQueue::notSent() const {
@@ -100,6 +130,7 @@ bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
   });
   if (record == _pending.end()) return false;
   _tell(record->message, wire::Step::acknowledged, wire::Reason::datagram_acknowledged);
+  recordEnd(*record, "");
   _pending.erase(record);
   return true;
 }

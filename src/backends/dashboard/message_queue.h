@@ -30,6 +30,12 @@ class MessageQueue {
   // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
   // or acknowledged.
   using Tell = std::function<void(std::uint64_t message, wire::Step step, wire::Reason reason)>;
+  // Told of each datagram that has been sent once, and once more when it has been sent for the last time.
+  struct Recorder {
+    std::function<std::uint64_t(std::string_view datagram, const DatagramOwner& owner)> sent;
+    // `record`: what `sent` returned; `bytes`: of the datagram; `error`: one line, empty: none.
+    std::function<void(std::uint64_t record, std::size_t bytes, int transmissions, const char* error)> ended;
+  };
 
   // The result of a first transmission: whether it was sent, held, or lost for lack of memory; and why the
   // oldest datagram was dropped to make room, if it was.
@@ -48,17 +54,19 @@ class MessageQueue {
 
   // `shared`: by one-shot messages, each of which has its own back end, which starts at event number 1.
   MessageQueue(
-      bool reliableUDP, bool shared, Send send, Tell tell = [](auto&&...) {});
+      bool reliableUDP, bool shared, Send send, Recorder recorder = {}, Tell tell = [](auto&&...) {});
 
   // `charge` pays for the datagram while it waits. Without a charge it cannot wait. `message`: its number in
   // the record of fates.
   First tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                     std::optional<platform::Charge> charge, std::uint64_t message = 0);
+                     std::optional<platform::Charge> charge, const DatagramOwner& owner = {},
+                     std::uint64_t message = 0);
   Tick tick();
   // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. False
   // if there is none.
   bool acknowledge(std::uint16_t eventNumber);
-  void clear() { _pending.clear(); }
+  // Calls `drop` for each one that waits, and forgets it.
+  void clear(const std::function<void(const UDPPacketToSend&)>& drop = {});
 
   bool reliableUDP() const { return _reliableUDP; }
   bool empty() const { return _pending.empty(); }
@@ -72,10 +80,13 @@ class MessageQueue {
   // These return true if the record is to be removed.
   bool check(UDPPacketToSend& record, Tick& result);
   bool checkAcknowledgement(UDPPacketToSend& record, Tick& result);
+  std::uint64_t recordSent(std::string_view datagram, const DatagramOwner& owner) const;
+  void recordEnd(const UDPPacketToSend& record, const char* error) const;
 
   const bool _reliableUDP;
   const std::size_t _most;
   const Send _send;
+  const Recorder _recorder;
   const Tell _tell;
   // Oldest first.
   std::list<UDPPacketToSend> _pending;

@@ -49,8 +49,11 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _socket(std::move(socket)),
       _messageQueue(
           kind.reliableUDP, kind.shared,
-          [this](std::string_view datagram)
-              REQUIRES(_mutex) { return mayLeave(0, datagram.size()) && _socket.send(datagram); },
+          [this](std::string_view datagram) REQUIRES(_mutex) {
+            const bool room = !_kind.gate || _kind.gate->hasRoomForRecord();
+            return room && mayLeave(0, datagram.size()) && _socket.send(datagram);
+          },
+          recorder(),
           [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
             note(message, step, reason);
           }),
@@ -71,7 +74,7 @@ bool NetworkProcQueue::startReading(WorkPool& pool) {
 }
 
 wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                                              const wire::StepEntry& fate) {
+                                              const DatagramOwner& owner, const wire::StepEntry& fate) {
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
@@ -86,7 +89,7 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
     return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
   const MessageQueue::First first =
-      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), fate.message);
+      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner, fate.message);
   noteFirst(first, fate);
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
@@ -120,6 +123,23 @@ void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEnt
 
 bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
   return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
+}
+
+MessageQueue::Recorder NetworkProcQueue::recorder() const {
+  config::OwnerGate* const gate = _kind.gate;
+  if (!gate) return {};
+  const auto sent = [gate, to = _kind.address](std::string_view datagram, const DatagramOwner& owner) {
+    gate->datagramLeft(to, 1, datagram.size());
+    if (!gate->keepsRecords()) return std::uint64_t{0};
+    return gate->record({http::Departure::Kind::datagram, to, 1, datagram.size(), owner.client, owner.about},
+                        {}, datagram, nullptr);
+  };
+  const auto ended = [gate, to = _kind.address](std::uint64_t record, std::size_t bytes, int transmissions,
+                                                const char* error) {
+    if (transmissions > 1) gate->datagramLeft(to, 0, bytes * static_cast<std::size_t>(transmissions - 1));
+    gate->ended(record, {0, error, transmissions});
+  };
+  return {sent, ended};
 }
 
 // Batched events are dropped for a datagram that will wait for its acknowledgement, but not for one that
@@ -167,15 +187,18 @@ void NetworkProcQueue::end() {
 void NetworkProcQueue::dropWaiting() {
   const Lock held(_mutex);
   _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
-  clear(wire::Reason::datagram_refused_by_owner, wire::Reason::datagram_refused_by_owner);
+  noteEnd(wire::Reason::datagram_refused_by_owner, wire::Reason::datagram_refused_by_owner);
+  _messageQueue.clear([this](const UDPPacketToSend& waiting) {
+    if (_kind.gate) _kind.gate->receipt().add(http::Departure::Kind::datagram, waiting.owner.client, 1);
+  });
 }
 
-void NetworkProcQueue::clear(wire::Reason ofSent, wire::Reason ofNotSent) {
+// Of those that wait, which are given up.
+void NetworkProcQueue::noteEnd(wire::Reason ofSent, wire::Reason ofNotSent) const {
   for (const UDPPacketToSend& one : _messageQueue.pending()) {
     const bool sent = one.state == UDPPacketToSend::awaitsAcknowledgement;
     note(one.message, sent ? wire::Step::given_up : wire::Step::dropped, sent ? ofSent : ofNotSent);
   }
-  _messageQueue.clear();
 }
 
 // `reason` applies to the datagrams that were sent.
@@ -183,7 +206,8 @@ void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();
   _counters.count(wire::Reason::ended_before_sent, notSent);
   _counters.count(reason, _messageQueue.size() - notSent);
-  clear(reason, wire::Reason::ended_before_sent);
+  noteEnd(reason, wire::Reason::ended_before_sent);
+  _messageQueue.clear();
 }
 
 void NetworkProcQueue::armTimer(DeliverySchedule::Time time) {

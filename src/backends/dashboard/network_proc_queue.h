@@ -44,11 +44,10 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::chrono::milliseconds period{};
     // The dashboard's address, for those who ask whether it may be reached.
     std::string host;
+    std::string address;  // "udp://IP:PORT"
     // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
     config::OwnerGate* gate = nullptr;
     platform::FatePen pen = {};
-    // "udp://IP:PORT", for the record of fates.
-    std::string url = {};
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -62,7 +61,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // Called without a lock, because older data of the user may be dropped to make room.
   // `fate`: what the record says of it.
   wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                              const wire::StepEntry& fate = {});
+                              const DatagramOwner& owner = {}, const wire::StepEntry& fate = {});
   // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
@@ -73,7 +72,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // Gives up what waits.
   void dropWaiting();
   const std::string& host() const { return _kind.host; }
-  const std::string& url() const { return _kind.url; }
+  const std::string& address() const { return _kind.address; }
   bool reliableUDP() const { return _kind.reliableUDP; }
 
  private:
@@ -84,13 +83,15 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
+  // `events`: 1 for one that is to leave, without its bytes, which each transmission counts.
   bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
+  MessageQueue::Recorder recorder() const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);
   void note(std::uint64_t message, wire::Step step, wire::Reason reason) const;
   void noteFirst(const MessageQueue::First& first, wire::StepEntry fate) const;
-  void clear(wire::Reason ofSent, wire::Reason ofNotSent) REQUIRES(_mutex);
+  void noteEnd(wire::Reason ofSent, wire::Reason ofNotSent) const REQUIRES(_mutex);
   void giveUp(wire::Reason reason) REQUIRES(_mutex);
 
   platform::Counters& _counters;

@@ -3,11 +3,19 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 #include <string>
 
+#include "base/value.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::backends {
+
+// Whose a datagram is, as in http::Departure.
+struct DatagramOwner {
+  std::shared_ptr<const Dictionary> client;
+  Dictionary about;
+};
 
 struct UDPPacketToSend {
   enum State { notSent = 0, awaitsAcknowledgement = 1 };
@@ -24,6 +32,11 @@ struct UDPPacketToSend {
   // Ticks since the last transmission.
   int numberOfChecks = 0;
   int numberOfRetransmits = 0;
+  DatagramOwner owner{};
+  // In the history of what left; 0: none.
+  std::uint64_t record = 0;
+
+  int transmissions() const { return numberOfRetransmits + 1; }
 };
 
 }  // namespace veltrad::backends

@@ -1,15 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
-// Builds events.
+// Builds events, and changes those that were built before.
 #include "backends/https/event.h"
 
-#include <iterator>
+#include <algorithm>
 #include <string>
-#include <string_view>
 #include <utility>
-#include <vector>
 
-#include "backends/https/json_message.h"
+#include "backends/https/event_writer.h"
+#include "backends/https/json_fields.h"
 #include "config/client_types.h"
+#include "formats/json.h"
 
 namespace veltrad::backends {
 
@@ -19,39 +19,63 @@ std::int32_t coarsenedStart(double startTimeStamp) {
   return start / 60 * 60;
 }
 
-constexpr std::size_t kFixedFields = 17;
-
-// Merges fields into a payload in one pass. The fields are added in the order of their keys' bytes.
-class FieldMerge {
- public:
-  // `more` is how many entries will be added, also later.
-  FieldMerge(Dictionary payload, std::size_t more)
-      : _payload(std::move(payload).takeEntries()), _next(_payload.begin()) {
-    _entries.reserve(_payload.size() + more);
-  }
-  void add(std::string_view key, Value value) {
-    while (_next != _payload.end()) {
-      const int order = std::string_view(_next->first).compare(key);
-      if (order > 0) break;
-      if (order < 0) _entries.push_back(std::move(*_next));
-      ++_next;
-    }
-    _entries.emplace_back(key, std::move(value));
-  }
-  Dictionary merged() && {
-    std::move(_next, _payload.end(), std::back_inserter(_entries));
-    return Dictionary::fromEntries(std::move(_entries));
-  }
-
- private:
-  std::vector<Dictionary::Entry> _payload;
-  std::vector<Dictionary::Entry>::iterator _next;
-  std::vector<Dictionary::Entry> _entries;
-};
-
 std::string versionText(SelfVersion version) {
   std::string text = std::to_string(version.major);
   return text.append(1, '.').append(std::to_string(version.minor));
+}
+
+std::int32_t numberIn(const Dictionary& fields, const char* key, std::int32_t otherwise) {
+  return fields.contains(key) ? fields.int32(key).value_or(0) : otherwise;
+}
+
+// What filters decide by.
+struct EventKind {
+  std::int32_t method;
+  std::int32_t status;
+};
+
+bool settles(const Dictionary& userInfo, const FilterTable& filters, EventKind event) {
+  if (!fitsJSON(userInfo)) return false;
+  if (filters.empty()) return true;
+  const EventKind own{numberIn(userInfo, "_method", 0), numberIn(userInfo, "_status", 0)};
+  return std::all_of(userInfo.begin(), userInfo.end(), [&](const auto& field) {
+    return filters.actionOn(field.first, event.method, event.status) ==
+           filters.actionOn(field.first, own.method, own.status);
+  });
+}
+
+// A text whose length was not foreseen gives its spare room back, because it may be kept for long.
+void limitRoom(std::string& text) {
+  constexpr std::size_t kMostSpare = 128;
+  if (text.capacity() > text.size() + kMostSpare) text.shrink_to_fit();
+}
+
+void addFixedFields(EventWriter& writer, const SessionFacts& facts, const std::string& productFamily,
+                    const NumberedMessage& message, int timeZoneOffset) {
+  const DeviceFacts& device = facts.device;
+  const std::int32_t startTS = coarsenedStart(facts.startTimeStamp);
+  const double clientTS =
+      finiteOrMinusOne(startTS + (platform::timevalToSeconds(message.timestamp) - facts.startTimeStamp));
+  if (device.buildVersion) writer.add("_build", std::string_view(*device.buildVersion));
+  writer.add("_clientTS", clientTS);
+  writer.add("_clientVersion", unsigned{facts.clientVersion});
+  writer.add("_eventNumber", unsigned{message.eventID});
+  writer.add("_internal", 3u);
+  writer.add("_method", unsigned{message.method});
+  if (device.productVersion) writer.add("_osVersion", std::string_view(*device.productVersion));
+  writer.add("_productFamily", std::string_view(productFamily));
+  if (device.hardwareType) writer.add("_productModel", std::string_view(*device.hardwareType));
+  writer.add("_reportVers", std::string_view(versionText(facts.selfVersion)));
+  writer.add("_sender", std::string_view(senderCode(facts.compType)));
+  if (device.isInternal && isAdaptorClientType(facts.compType)) {
+    writer.add("_sessionID", facts.sessionID);
+  } else if (facts.combinedSessionIDString) {
+    writer.add("_sessionID", std::string_view(*facts.combinedSessionIDString));
+  }
+  writer.add("_startTS", startTS);
+  writer.add("_status", unsigned{message.respCode});
+  writer.add("_timezoneOffset", timeZoneOffset);
+  writer.add("eventTime", clientTS);
 }
 }  // namespace
 
@@ -60,36 +84,39 @@ std::string senderCode(std::int32_t compType) {
   return code ? code : "";
 }
 
-Dictionary createEventDictfromPayload(const SessionFacts& facts, const std::string& productFamily,
-                                      NumberedMessage&& message, int timeZoneOffset) {
-  const DeviceFacts& device = facts.device;
-  const std::int32_t startTS = coarsenedStart(facts.startTimeStamp);
-  const double clientTS =
-      finiteOrMinusOne(startTS + (platform::timevalToSeconds(message.timestamp) - facts.startTimeStamp));
+EventText eventText(const Dictionary& event) {
+  return {formats::writeJSON(event), event.size()};
+}
 
-  const std::size_t userFields = facts.sentUserInfo ? facts.sentUserInfo->size() : 0;
-  FieldMerge event(message.payload ? std::move(*message.payload) : Dictionary(), kFixedFields + userFields);
-  if (device.buildVersion) event.add("_build", *device.buildVersion);
-  event.add("_clientTS", clientTS);
-  event.add("_clientVersion", unsigned{facts.clientVersion});
-  event.add("_eventNumber", unsigned{message.eventID});
-  event.add("_internal", 3u);
-  event.add("_method", unsigned{message.method});
-  if (device.productVersion) event.add("_osVersion", *device.productVersion);
-  event.add("_productFamily", productFamily);
-  if (device.hardwareType) event.add("_productModel", *device.hardwareType);
-  event.add("_reportVers", versionText(facts.selfVersion));
-  event.add("_sender", senderCode(facts.compType));
-  if (device.isInternal && isAdaptorClientType(facts.compType)) {
-    event.add("_sessionID", facts.sessionID);
-  } else if (facts.combinedSessionIDString) {
-    event.add("_sessionID", *facts.combinedSessionIDString);
+void changeEvent(EventText& event, const std::function<void(Dictionary&)>& change) {
+  auto read = formats::parseJSON(event.json);
+  auto fields = read ? std::move(read.value()).takeDictionary() : std::nullopt;
+  if (!fields) return;  // it is no dictionary if filters have left nothing but a field like "$date"
+  change(*fields);
+  event = eventText(*fields);
+}
+
+WrittenEvent writeEvent(const SessionFacts& facts, const std::string& productFamily,
+                        const NumberedMessage& message, int timeZoneOffset, const FilterTable& filters,
+                        std::size_t expectedBytes) {
+  static const Dictionary kNone;
+  const Dictionary& userInfo = facts.sentUserInfo ? *facts.sentUserInfo : kNone;
+  const EventKind kind{numberIn(userInfo, "_method", message.method),
+                       numberIn(userInfo, "_status", message.respCode)};
+  WrittenEvent event;
+  event.text.json.reserve(expectedBytes);
+  {
+    EventWriter writer(message.payload ? *message.payload : kNone, userInfo, filters, kind.method,
+                       kind.status, event);
+    addFixedFields(writer, facts, productFamily, message, timeZoneOffset);
+    writer.finish();
   }
-  event.add("_startTS", startTS);
-  event.add("_status", unsigned{message.respCode});
-  event.add("_timezoneOffset", timeZoneOffset);
-  event.add("eventTime", clientTS);
-  return std::move(event).merged();
+  limitRoom(event.text.json);
+  const bool sendsMethod =
+      filters.empty() || filters.actionOn("_method", kind.method, kind.status) == config::FilterAction::keep;
+  event.method = sendsMethod ? kind.method : 0;
+  event.settled = settles(userInfo, filters, kind);
+  return event;
 }
 
 }  // namespace veltrad::backends

@@ -2,15 +2,17 @@
 // Keeps a batch within its bounds.
 #include "backends/https/event_batch.h"
 
-#include "formats/json.h"
+#include <utility>
 
 namespace veltrad::backends {
 
-EventSize sizeOfEvent(const Dictionary& event) {
-  // During a flush there are the compact text, the readable text and the compressed body.
-  constexpr std::size_t kTexts = 3;
-  const std::size_t json = formats::jsonBytesAtMost(event);
-  return {json, sizeof(Dictionary) + keptBytes(event) + kTexts * json};
+EventSize sizeOfEvent(const EventText& event) {
+  // A flush makes a body, which may be as long as the text, and a readable text, where each field and the
+  // event's two brackets have a line of their own.
+  constexpr std::size_t kLine = 8, kBrackets = 2, kTexts = 2;
+  const std::size_t json = event.json.size();
+  return {json, sizeof(EventBatch::Event) + keptBytes(event.json) + kTexts * json +
+                    kLine * (event.fields + kBrackets)};
 }
 
 std::optional<std::uint64_t> EventBatch::oldestTurn() const {
@@ -27,10 +29,9 @@ bool EventBatch::full(const EventSize& event) const {
   return _events.size() >= kMostEvents || _bytes.json + event.json > kMostBytes;
 }
 
-void EventBatch::add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn,
-                     std::uint64_t message) {
-  account(size);
-  _events.push_back({std::move(event), size, turn, message});
+void EventBatch::add(std::int32_t method, Event event) {
+  account(event.size);
+  _events.push_back(std::move(event));
   ++_counts[method];
 }
 
@@ -45,18 +46,21 @@ std::uint64_t EventBatch::dropOldest() {
 void EventBatch::setSessionID(const std::string& sessionID) {
   for (Event& event : _events) {
     unaccount(event.size);
-    event.fields.set("_sessionID", sessionID);
-    event.size = sizeOfEvent(event.fields);
+    changeEvent(event.text, [&](Dictionary& fields) { fields.set("_sessionID", sessionID); });
+    event.size = sizeOfEvent(event.text);
     account(event.size);
   }
 }
 
-std::vector<Dictionary> EventBatch::take() {
+void EventBatch::unsettle() {
+  for (Event& event : _events) event.settled = false;
+}
+
+std::deque<EventBatch::Event> EventBatch::take() {
   _counts.clear();
-  std::vector<Dictionary> taken;
-  taken.reserve(_events.size());
-  for (Event& event : _events) taken.push_back(std::move(event.fields));
-  discard();
+  std::deque<Event> taken;
+  taken.swap(_events);
+  _bytes = {};
   return taken;
 }
 

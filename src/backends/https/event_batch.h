@@ -8,22 +8,31 @@
 #include <map>
 #include <optional>
 #include <string>
-#include <vector>
 
-#include "base/value.h"
+#include "backends/https/event.h"
 
 namespace veltrad::backends {
 
-// Upper bounds in bytes: of an event's JSON text, and of the memory for the event and what a flush makes of
-// it.
+// In bytes: of an event's JSON text, and of the memory for the event and what a flush makes of it.
 struct EventSize {
   std::size_t json = 0;
   std::size_t charged = 0;
 };
-EventSize sizeOfEvent(const Dictionary& event);
+EventSize sizeOfEvent(const EventText& event);
 
 class EventBatch {
  public:
+  struct Event {
+    EventText text;
+    EventSize size;
+    // MemoryAccount::nextTurn.
+    std::uint64_t turn = 0;
+    // See WrittenEvent; false once the user info or the filters have changed.
+    bool settled = false;
+    // Its message's, in the record of fates.
+    std::uint64_t message = 0;
+  };
+
   // The bounds of a batch, whatever the thresholds in the storebag are. Bytes are those of the JSON texts.
   static constexpr std::size_t kMostEvents = 4096;
   static constexpr std::size_t kMostBytes = 4u << 20;
@@ -39,27 +48,21 @@ class EventBatch {
   bool thresholdReached(std::int32_t method, std::int32_t threshold) const;
   // Whether the event would exceed a bound.
   bool full(const EventSize& event) const;
-  // `message`: its number in the record of fates.
-  void add(std::int32_t method, Dictionary event, const EventSize& size, std::uint64_t turn,
-           std::uint64_t message = 0);
+  void add(std::int32_t method, Event event);
   // Returns the number of its message.
   std::uint64_t dropOldest();
   // Called after a flush that a threshold caused, whatever its result.
   void restartCount(std::int32_t method) { _counts[method] = 0; }
 
   void setSessionID(const std::string& sessionID);
+  // No event is settled any more.
+  void unsettle();
   // Returns the events and clears the counts.
-  std::vector<Dictionary> take();
+  std::deque<Event> take();
   // Drops the events but keeps the counts.
   void discard();
 
  private:
-  struct Event {
-    Dictionary fields;
-    EventSize size;
-    std::uint64_t turn;
-    std::uint64_t message;
-  };
   void account(const EventSize& size);
   void unaccount(const EventSize& size);
 

@@ -8,6 +8,7 @@
 #include <cstdint>
 #include <utility>
 
+#include "backends/https/json_fields.h"
 #include "config/operator_settings.h"
 #include "platform/counters.h"
 #include "platform/log.h"
@@ -46,11 +47,12 @@ void EventPosts::restrict(Dictionary& event) const {
   _counters.count(wire::Reason::field_not_json, restrictEventForJSON(event));
 }
 
-JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<Dictionary> events,
-                                                       const std::string& clientID, bool wantPretty,
-                                                       std::size_t expectedBytes) const {
+JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<std::string> events,
+                                                       const std::string& clientID, bool wantPretty) const {
   const double postTime = platform::timevalToSeconds(_clock.now());
-  return makeJSONMessage(postTime, clientID, std::move(events), wantPretty, expectedBytes);
+  JSONMessage message{PostText(postTime, clientID, std::move(events)), std::nullopt};
+  if (wantPretty) message.pretty = message.text.readable();
+  return message;
 }
 
 std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
@@ -63,8 +65,10 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
     return wire::Reason::post_url_nil;
   }
   http::HTTPRequest request =
-      makePostRequest(facts, *url, std::move(post.json), post.eventMap, {_gzip, compressionLevel()});
+      makePostRequest(facts, *url, post.text, post.eventMap, {_gzip, compressionLevel()});
   request.events = post.eventCount;
+  request.client = facts.client;
+  request.about = std::move(post.about);
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {

@@ -28,22 +28,23 @@ class EventPosts {
       : _http(http), _clock(clock), _counters(counters), _choices(choices) {}
 
   struct Post {
-    std::string json;
+    PostText text;
     std::optional<EventMap> eventMap;
     std::size_t eventCount = 0;
     // Pays for the post and for `completionBytes`, which the completion (it may be empty) keeps.
     platform::Charge charge;
     std::size_t completionBytes = 0;
     VeltraBackend::FlushCompletion completion;
+    // As in http::Departure.
+    Dictionary about = {};
     // What the record of fates is to say of it: its message or batch.
-    wire::StepEntry fate;
+    wire::StepEntry fate = {};
   };
 
   // Removes and counts fields that JSON cannot represent.
   void restrict(Dictionary& event) const;
-  // The events have been restricted. `expectedBytes` as for writeJSON.
-  JSONMessage createMessageForPostAndLogging(std::vector<Dictionary> events, const std::string& clientID,
-                                             bool wantPretty, std::size_t expectedBytes) const;
+  JSONMessage createMessageForPostAndLogging(std::vector<std::string> events, const std::string& clientID,
+                                             bool wantPretty) const;
   // The post keeps the back end alive. A status of 5xx disables the back end. Returns why the post has not
   // begun, if it has not.
   std::optional<wire::Reason> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,

@@ -2,7 +2,7 @@
 // Applies filters to events.
 #include "backends/https/filter_table.h"
 
-#include <optional>
+#include <vector>
 
 #include "backends/backend.h"
 #include "base/text.h"
@@ -10,22 +10,18 @@
 
 namespace veltrad::backends {
 
-namespace {
 using config::FilterAction;
 
-// The digest of a text, or of the JSON text of a number or boolean. Nothing for other values, which are then
-// removed, because a field that is to be hashed must never leave in clear.
-std::optional<std::string> digestOf(const Value& value) {
+std::optional<std::string> FilterTable::digestOf(const Value& value) {
   if (const std::string* text = value.asString()) return VeltraBackend::convertIntoSHA256(*text);
   if (value.isNumber() || value.isBoolean())
     return VeltraBackend::convertIntoSHA256(formats::writeJSON(value));
   return std::nullopt;
 }
 
-FilterAction actionOn(const config::Filters& filters, const std::string& key, std::int32_t method,
-                      std::int32_t status) {
-  const auto records = filters.ofKey.find(lowerCase(key));
-  if (records == filters.ofKey.end()) return FilterAction::keep;
+FilterAction FilterTable::actionOn(std::string_view key, std::int32_t method, std::int32_t status) const {
+  const auto records = _filters->ofKey.find(lowerCase(key));
+  if (records == _filters->ofKey.end()) return FilterAction::keep;
   for (const config::filterTag& record : records->second) {
     const bool methodFits = record.method < 0 || record.method == method;
     const bool statusFits = record.status < 0 || record.status == status;
@@ -33,7 +29,6 @@ FilterAction actionOn(const config::Filters& filters, const std::string& key, st
   }
   return FilterAction::keep;
 }
-}  // namespace
 
 bool FilterTable::concerns(const std::string& name) const {
   return _filters && !_filters->ofKey.empty() && _filters->ofKey.contains(lowerCase(name));
@@ -41,13 +36,13 @@ bool FilterTable::concerns(const std::string& name) const {
 
 FilterTable::Outcome FilterTable::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
   Outcome outcome;
-  if (!_filters || _filters->ofKey.empty()) return outcome;
+  if (empty()) return outcome;
   const std::int32_t method = event.int32("_method").value_or(0);
   const std::int32_t status = event.int32("_status").value_or(0);
   std::vector<Dictionary::Entry> kept;
   kept.reserve(event.size());
   for (const auto& [key, value] : event) {
-    const FilterAction action = actionOn(*_filters, key, method, status);
+    const FilterAction action = actionOn(key, method, status);
     if (action == FilterAction::keep) {
       kept.emplace_back(key, value);
       continue;

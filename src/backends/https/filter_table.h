@@ -3,7 +3,10 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
+#include <optional>
 #include <string>
+#include <string_view>
 
 #include "base/value.h"
 #include "config/client_entry.h"
@@ -26,6 +29,15 @@ class FilterTable {
   bool concerns(const std::string& name) const;
   // Filters the event in place by its own "_method" and "_status" (0 if missing). `changes` hears the names.
   Outcome filterEvent(Dictionary& event, config::FieldChanges& changes) const;
+  // True if every field is kept.
+  bool empty() const { return !_filters || _filters->ofKey.empty(); }
+  // What happens to a field of an event with this method and status. Not empty().
+  config::FilterAction actionOn(std::string_view key, std::int32_t method, std::int32_t status) const;
+  // The digest of a text, or of the JSON text of a number or boolean. Nothing for other values, which are
+  // then removed, because a field that is to be hashed must never leave in clear.
+  static std::optional<std::string> digestOf(const Value& value);
+  // The same filters.
+  bool operator==(const FilterTable&) const = default;
 
  private:
   const config::Filters* _filters = nullptr;

@@ -20,23 +20,29 @@ HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,
   return _batch.full(size) ? Need::bound : Need::room;
 }
 
-void HeldEvents::add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
-                     std::uint64_t turn, std::uint64_t sessionIDChanges, wire::Step step,
-                     wire::StepEntry fate) {
+void HeldEvents::add(std::int32_t method, EventBatch::Event event, platform::Charge charge,
+                     std::uint64_t sessionIDChanges, wire::Step step, wire::StepEntry fate) {
   std::size_t dropped = 0;
+  std::size_t overShare = 0;
   {
     const Lock held(_mutex);
-    for (; _batch.size() > 0 && _batch.full(size); ++dropped) dropOldest(wire::Reason::batch_full);
+    for (; _batch.size() > 0 && _batch.full(event.size); ++dropped) dropOldest(wire::Reason::batch_full);
     _charge.add(std::move(charge));
     const bool changed = sessionIDChanges != _sessionIDChanges.load(std::memory_order_relaxed);
-    if (changed) event.set("_sessionID", _sessionID);
+    if (changed) {
+      changeEvent(event.text,
+                  [this](Dictionary& fields) REQUIRES(_mutex) { fields.set("_sessionID", _sessionID); });
+      event.size = sizeOfEvent(event.text);
+    }
     if (_batchNumber == 0) _batchNumber = _pen.newNumber();
     fate.batch = _batchNumber;
     _pen.write(step, std::nullopt, fate);
-    _batch.add(method, std::move(event), size, turn, fate.message);
-    if (dropped > 0) settle();
+    event.message = fate.message;
+    _batch.add(method, std::move(event));
+    if (dropped > 0 || changed) overShare = settle();
   }
   _counters.count(wire::Reason::batch_full, dropped);
+  _counters.count(wire::Reason::event_over_share, overShare);
 }
 
 void HeldEvents::restartCount(std::int32_t method) {
@@ -56,15 +62,20 @@ void HeldEvents::setSessionID(const std::string& sessionID) {
   _counters.count(wire::Reason::event_over_share, dropped);
 }
 
-HeldEvents::Taken HeldEvents::take() {
+void HeldEvents::unsettle() {
   const Lock held(_mutex);
-  const std::size_t jsonBytes = _batch.jsonBytes();
-  return {_batch.take(), std::move(_charge), jsonBytes, std::exchange(_batchNumber, 0)};
+  _batch.unsettle();
 }
 
-void HeldEvents::discard(wire::Reason why) {
+HeldEvents::Taken HeldEvents::take() {
   const Lock held(_mutex);
-  _counters.count(why, _batch.size());
+  return {_batch.take(), std::move(_charge), std::exchange(_batchNumber, 0)};
+}
+
+std::size_t HeldEvents::discard(wire::Reason why) {
+  const Lock held(_mutex);
+  const std::size_t events = _batch.size();
+  _counters.count(why, events);
   if (_batch.size() > 0) {
     wire::StepEntry fate;
     fate.batch = std::exchange(_batchNumber, 0);
@@ -72,6 +83,7 @@ void HeldEvents::discard(wire::Reason why) {
   }
   _batch.discard();
   _charge.release();
+  return events;
 }
 
 void HeldEvents::dropOldest(wire::Reason why) {

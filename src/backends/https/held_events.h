@@ -5,10 +5,10 @@
 
 #include <atomic>
 #include <cstdint>
+#include <deque>
 #include <optional>
 #include <string>
 #include <utility>
-#include <vector>
 
 #include "backends/https/event_batch.h"
 #include "backends/lock_ranks.h"
@@ -24,10 +24,8 @@ class HeldEvents final : public platform::Evictable {
  public:
   // The charge pays for the events and for what a flush makes of them.
   struct Taken {
-    std::vector<Dictionary> events;
+    std::deque<EventBatch::Event> events;
     platform::Charge charge;
-    // An upper bound on the events' JSON texts.
-    std::size_t jsonBytes = 0;
     // In the record of fates.
     std::uint64_t batch = 0;
   };
@@ -45,13 +43,14 @@ class HeldEvents final : public platform::Evictable {
   std::uint64_t sessionIDChanges() const { return _sessionIDChanges.load(std::memory_order_acquire); }
   // Drops the oldest events if the batch is full. `charge` pays for the event; `step` and `fate` are what the
   // record of fates says of it.
-  void add(std::int32_t method, Dictionary event, const EventSize& size, platform::Charge charge,
-           std::uint64_t turn, std::uint64_t sessionIDChanges, wire::Step step, wire::StepEntry fate);
+  void add(std::int32_t method, EventBatch::Event event, platform::Charge charge,
+           std::uint64_t sessionIDChanges, wire::Step step, wire::StepEntry fate);
   void restartCount(std::int32_t method);
   void setSessionID(const std::string& sessionID);
+  void unsettle();
   Taken take();
-  // Counts the events that are dropped.
-  void discard(wire::Reason why);
+  // Counts the events that are dropped, and returns how many.
+  std::size_t discard(wire::Reason why);
 
   std::optional<std::uint64_t> oldestTurn() const override;
   void dropOldest() override;

@@ -2,11 +2,13 @@
 // Posts or batches messages, and flushes batches.
 #include "backends/https/https_post_backend.h"
 
+#include <algorithm>
 #include <utility>
 
-#include "backends/https/event.h"
 #include "backends/https/event_posts.h"
+#include "backends/https/json_fields.h"
 #include "config/noted_changes.h"
+#include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
 #include "platform/log.h"
@@ -26,7 +28,7 @@ bool meansSamplingOverride(std::int32_t flag) {
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     const HTTPSPostMaking& making, const std::string& name,
-    std::shared_ptr<const config::HTTPSPostProfile> profile,
+    const std::shared_ptr<const config::HTTPSPostProfile>& profile,
     const std::optional<std::string>& productFamily) {
   if (!profile || !productFamily) return nullptr;
   if (!profile->clients) {
@@ -34,8 +36,7 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     making.counters.count(wire::Reason::no_clients);
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(
-      new HTTPSPostBackend(making, name, std::move(profile), *productFamily));
+  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, profile, *productFamily));
   if (!made->_clientState.identity().known()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -44,12 +45,13 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   std::shared_ptr<const config::HTTPSPostProfile> profile,
+                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
                                    const std::string& productFamily)
     : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
       _counters(making.counters),
       _posts(making.posts),
+      _gate(making.gate),
       _clientState(*this, profile, making.locale, making.counters, making.identity),
       _held(std::make_shared<HeldEvents>(making.counters, making.pen)) {
   setDisplayURL(profile->displayURL);
@@ -68,7 +70,8 @@ std::vector<std::string> HTTPSPostBackend::hosts() const {
 }
 
 void HTTPSPostBackend::dropWaiting() {
-  _held->discard(wire::Reason::refused_by_owner);
+  const std::size_t dropped = _held->discard(wire::Reason::refused_by_owner);
+  if (_gate) _gate->receipt().add(http::Departure::Kind::post, facts()->client, dropped);
 }
 
 BackendActivity HTTPSPostBackend::activity() const {
@@ -97,15 +100,9 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
       logError("HTTPSPostBackend(sendMessage): SESSION_TYPE_STOP message dictionary is nil");
     }
   }
-  Dictionary event =
-      createEventDictfromPayload(*facts, productFamily(), std::move(message), _locale.timeZoneOffset());
-  if (facts->sentUserInfo) event.merge(*facts->sentUserInfo);
-  {
-    config::NotedChanges changes(
-        pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
-    if (facts->userInfoEdits) changes.changed(*facts->userInfoEdits);
-    filterEvent(event, changes);
-  }
+  WrittenEvent event = writeEvent(*facts, message);
+  noteEdits(*facts, message, event.edits);
+  addOwnersEdits(*facts, message.note, event.edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
   }
@@ -121,7 +118,41 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   return postEvent(std::move(event), *facts, message);
 }
 
-Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
+WrittenEvent HTTPSPostBackend::writeEvent(const SessionFacts& facts, const NumberedMessage& message) {
+  constexpr std::size_t kMoreOrLess = 64, kLongest = 8192;
+  noteUserInfo(facts);
+  WrittenEvent event = backends::writeEvent(facts, productFamily(), message, _locale.timeZoneOffset(),
+                                            _clientState.filters(), _lastLength + kMoreOrLess);
+  _lastLength = std::min(event.text.json.size(), kLongest);
+  count(event.filtered);
+  _counters.count(wire::Reason::field_not_json, event.notJSON);
+  return event;
+}
+
+// Events that were written with other user info or filters get the present ones when they are flushed.
+void HTTPSPostBackend::noteUserInfo(const SessionFacts& facts) {
+  if (facts.sentUserInfo == _writtenInfo && _clientState.filters() == _writtenFilters) return;
+  _held->unsettle();
+  _writtenInfo = facts.sentUserInfo;
+  _writtenFilters = _clientState.filters();
+}
+
+bool HTTPSPostBackend::recorded() const {
+  return _gate != nullptr && _gate->keepsRecords();
+}
+
+void HTTPSPostBackend::addOwnersEdits(const SessionFacts& facts, const MessageNote& note,
+                                      config::EditedFields& edits) const {
+  if (!recorded()) return;
+  if (note.edits) edits.add(*note.edits);
+  if (facts.userInfoEdits) edits.add(*facts.userInfoEdits);
+}
+
+Dictionary HTTPSPostBackend::about(const SessionFacts& facts, const config::EditedFields& edits) const {
+  return recorded() ? aboutDeparture(name(), facts, _clientState.entry(), edits) : Dictionary();
+}
+
+Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
                                  const NumberedMessage& message) {
   const bool realtime = meansRealtime(message.flag);
   std::optional<std::string> flushed;
@@ -134,17 +165,16 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   }
   logDebug("HTTPSPostBackend(sendMessage): Sending %d, %d, %d", state(), _clientState.batchEvents(facts),
            facts.requireUserInfo);
-  _posts.restrict(event);
   std::optional<platform::Charge> charge{std::in_place};
-  const EventSize size = sizeOfEvent(event);
+  const EventSize size = sizeOfEvent(event.text);
   if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
   const wire::StepEntry fate = stepOf(message);
   if (!charge) {
     return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr, fate)}, std::move(flushed)};
   }
-  std::vector<Dictionary> events;
-  events.push_back(std::move(event));
-  JSONMessage posted = createMessage(std::move(events), facts, size.json);
+  std::vector<std::string> events;
+  events.push_back(std::move(event.text.json));
+  JSONMessage posted = createMessage(std::move(events), facts);
   std::optional<std::string> result = std::move(posted.pretty);
   if (flushed) {
     result = "Flushed events:\n" + *flushed + "\nStandalone event:\n" + result.value_or("(null)");
@@ -153,8 +183,8 @@ Sent HTTPSPostBackend::postEvent(Dictionary event, const SessionFacts& facts,
   const wire::Reason why = stateVerdict().reason;  // before an answer can change it
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
-                             {std::move(posted.compact), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr, fate});
+                             {std::move(posted.text), EventMap{message.method, message.respCode}, 1,
+                              std::move(*charge), 0, nullptr, about(facts, event.edits), fate});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -169,20 +199,16 @@ void HTTPSPostBackend::addStopFields(Dictionary& payload, bool batching) const {
   payload.merge(fields);
 }
 
-void HTTPSPostBackend::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
-  const FilterTable::Outcome outcome = _clientState.filters().filterEvent(event, changes);
+void HTTPSPostBackend::count(const FilterTable::Outcome& outcome) const {
   if (outcome.removed > 0) _counters.count(wire::Reason::field_removed, outcome.removed);
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
-Sent HTTPSPostBackend::batchEvent(Dictionary event, const NumberedMessage& message,
+Sent HTTPSPostBackend::batchEvent(WrittenEvent event, const NumberedMessage& message,
                                   platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
-  // User info and filters may have changed the event's method.
-  const std::int32_t method = event.int32("_method").value_or(0);
-  // Removes these fields now, so that they take no memory until the flush.
-  _posts.restrict(event);
+  const std::int32_t method = event.method;
   std::optional<std::string> flushed;
-  const EventSize size = sizeOfEvent(event);
+  const EventSize size = sizeOfEvent(event.text);
   const HeldEvents::Need need = _held->needOf(method, _clientState.eventThreshold(), size);
   if (need == HeldEvents::Need::flush) {
     logDebug(
@@ -193,6 +219,10 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, const NumberedMessage& messa
     _held->restartCount(method);
   } else if (need == HeldEvents::Need::bound && state() == kBackendReporting) {
     flushed = flushMessagesWithCompletion(nullptr);
+  }
+  if (recorded()) {
+    if (_held->empty()) _batchEdits = {};
+    _batchEdits.add(event.edits);
   }
   // Drops events of the user's other batches if necessary.
   auto charge = account ? account->keep(size.charged) : platform::Charge();
@@ -205,8 +235,9 @@ Sent HTTPSPostBackend::batchEvent(Dictionary event, const NumberedMessage& messa
     return sent;
   }
   if (account && !std::exchange(_evictable, true)) account->add(_held);
-  _held->add(method, std::move(event), size, std::move(*charge), account ? account->nextTurn() : 0,
-             sessionIDChanges, reports ? wire::Step::batched : wire::Step::held, stepOf(message));
+  _held->add(method, {std::move(event.text), size, account ? account->nextTurn() : 0, event.settled},
+             std::move(*charge), sessionIDChanges, reports ? wire::Step::batched : wire::Step::held,
+             stepOf(message));
   return sent;
 }
 
@@ -225,27 +256,21 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     return std::nullopt;
   }
   logDebug("HTTPSPostBackend(flushMessagesWithCompletion): called");
+  noteUserInfo(*facts);
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
   wire::StepEntry fate;
   fate.batch = taken.batch;
   pen().write(wire::Step::flushed, std::nullopt, fate);
-  if (facts->sentUserInfo) {
-    const Dictionary filtered = refilled(*facts, taken.batch);
-    const std::size_t more = count * sizeOfEvent(filtered).charged;
-    if (facts->account && !facts->account->keepMore(taken.charge, more)) {
-      _posts.refusePost(*this, count, completion, fate);
-      return std::nullopt;
-    }
-    // The events themselves were restricted when they were batched.
-    const bool restricts = !fitsJSON(filtered);
-    for (Dictionary& event : taken.events) {
-      event.merge(filtered);
-      if (restricts) _posts.restrict(event);
-    }
-    taken.jsonBytes += count * sizeOfEvent(filtered).json;
+  config::EditedFields edits = std::exchange(_batchEdits, {});
+  if (facts->sentUserInfo && !mergeUserInfo(taken, *facts, edits)) {
+    _posts.refusePost(*this, count, completion, fate);
+    return std::nullopt;
   }
-  JSONMessage posted = createMessage(std::move(taken.events), *facts, taken.jsonBytes);
+  std::vector<std::string> events;
+  events.reserve(count);
+  for (EventBatch::Event& event : taken.events) events.push_back(std::move(event.text.json));
+  JSONMessage posted = createMessage(std::move(events), *facts);
   std::optional<std::string> pretty = std::move(posted.pretty);
   FlushCompletion whenPosted;
   std::size_t completionBytes = 0;
@@ -257,40 +282,72 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
     };
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
-                         {std::move(posted.compact), std::nullopt, count, std::move(taken.charge),
-                          completionBytes, std::move(whenPosted), fate});
+                         {std::move(posted.text), std::nullopt, count, std::move(taken.charge),
+                          completionBytes, std::move(whenPosted), about(*facts, edits), fate});
   return pretty;
 }
 
-// What a flush adds to each event of the batch: the user info, filtered without the methods and statuses of
-// the events. A field that the event's own filter had changed may so leave as it is.
-Dictionary HTTPSPostBackend::refilled(const SessionFacts& facts, std::uint64_t batch) const {
-  const Dictionary& sent = *facts.sentUserInfo;
+bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts,
+                                     config::EditedFields& edits) {
+  Dictionary info = *facts.sentUserInfo;
+  config::EditedFields own;
+  count(_clientState.filters().filterEvent(info, own));
+  edits.add(own);
+  addOwnersEdits(facts, {}, edits);
+  const auto unsettled = static_cast<std::size_t>(std::count_if(
+      taken.events.begin(), taken.events.end(), [](const auto& event) { return !event.settled; }));
+  if (unsettled == 0) return true;
+  noteMerge(facts, own, taken.batch);
+  const std::size_t more = unsettled * sizeOfEvent(eventText(info)).charged;
+  if (facts.account && !facts.account->keepMore(taken.charge, more)) return false;
+  // The events themselves were restricted when they were written.
+  const bool restricts = !fitsJSON(info);
+  for (EventBatch::Event& event : taken.events) {
+    if (event.settled) continue;
+    changeEvent(event.text, [&](Dictionary& fields) {
+      fields.merge(info);
+      if (restricts) _posts.restrict(fields);
+    });
+  }
+  return true;
+}
+
+void HTTPSPostBackend::noteEdits(const SessionFacts& facts, const NumberedMessage& message,
+                                 const config::EditedFields& edits) const {
+  if (edits.empty() && !facts.userInfoEdits) return;
+  config::NotedChanges changes(
+      pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
+  if (facts.userInfoEdits) changes.changed(*facts.userInfoEdits);
+  changes.changed(edits);
+}
+
+// The user info was filtered without the methods and statuses of the events, so that a field that an event's
+// own filter had changed may leave as it is.
+void HTTPSPostBackend::noteMerge(const SessionFacts& facts, const config::EditedFields& edits,
+                                 std::uint64_t batch) const {
+  if (!pen().writes()) return;
   const config::EditedFields* kept = facts.userInfoEdits.get();
-  Dictionary filtered = sent;
-  config::EditedFields edits;
-  filterEvent(filtered, edits);
-  if (!pen().writes()) return filtered;
   config::NotedChanges changes(pen(), {.time = pen().ring()->now(), .batch = batch});
-  for (const auto& [name, value] : sent) {
-    const bool hashed = edits.hashed.contains(name) || (kept && kept->hashed.contains(name));
+  for (const auto& [name, value] : *facts.sentUserInfo) {
     if (edits.removed.contains(name)) continue;
-    if (hashed) {
+    if (edits.hashed.contains(name) || (kept && kept->hashed.contains(name))) {
       changes.changed(config::FieldChange::hashed, name);
     } else if (_clientState.filters().concerns(name)) {
       changes.restored(name);
     }
   }
-  return filtered;
 }
 
-JSONMessage HTTPSPostBackend::createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
-                                            std::size_t eventBytes) const {
-  constexpr std::size_t kEnvelope = 128;
+JSONMessage HTTPSPostBackend::createMessage(std::vector<std::string> events,
+                                            const SessionFacts& facts) const {
   const PostIdentity& identity = _clientState.identity();
-  const std::string& client = identity.clientIdentifier(facts.device);
-  return _posts.createMessageForPostAndLogging(std::move(events), client, identity.loggingAllowed(),
-                                               kEnvelope + client.size() + eventBytes);
+  return _posts.createMessageForPostAndLogging(std::move(events), identity.clientIdentifier(facts.device),
+                                               identity.loggingAllowed());
+}
+
+void HTTPSPostBackend::takeIdentity(const std::string& udid) {
+  VeltraBackend::takeIdentity(udid);
+  _clientState.renewIdentifiers();
 }
 
 void HTTPSPostBackend::setCorrelatedSessionID(const std::string& sessionID) {

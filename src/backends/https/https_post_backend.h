@@ -9,9 +9,14 @@
 #include <vector>
 
 #include "backends/backend.h"
+#include "backends/https/event.h"
 #include "backends/https/held_events.h"
 #include "backends/https/https_post_state.h"
 #include "backends/https/json_message.h"
+
+namespace veltrad::config {
+class OwnerGate;
+}  // namespace veltrad::config
 
 namespace veltrad::backends {
 
@@ -25,6 +30,8 @@ struct HTTPSPostMaking {
   EventPosts& posts;
   platform::FatePen pen;
   PostIdentity::Sources identity;
+  // Null: the owner sets no limits.
+  config::OwnerGate* gate = nullptr;
 };
 
 class HTTPSPostBackend final : public VeltraBackend {
@@ -32,13 +39,15 @@ class HTTPSPostBackend final : public VeltraBackend {
   // Null without a profile, a product family or, after an error line, the profile's "clients".
   static std::shared_ptr<HTTPSPostBackend> initWithName(
       const HTTPSPostMaking& making, const std::string& name,
-      std::shared_ptr<const config::HTTPSPostProfile> profile,
+      const std::shared_ptr<const config::HTTPSPostProfile>& profile,
       const std::optional<std::string>& productFamily);
 
   void updateState() override;
   Sent sendNumberedMessage(NumberedMessage&& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
   void setCorrelatedSessionID(const std::string& sessionID) override;
+  void takeIdentity(const std::string& udid) override;
+  void rereadConsent() override { _clientState.rereadConsent(); }
   BackendActivity activity() const override;
   std::vector<std::string> hosts() const override;
   bool hostsAreFixed() const override { return false; }
@@ -47,28 +56,45 @@ class HTTPSPostBackend final : public VeltraBackend {
   void dropWaiting() override;
 
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                   std::shared_ptr<const config::HTTPSPostProfile> profile, const std::string& productFamily);
+                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+                   const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
-  // Counts the changes; `changes` hears the names.
-  void filterEvent(Dictionary& event, config::FieldChanges& changes) const;
-  Sent batchEvent(Dictionary event, const NumberedMessage& message, platform::MemoryAccount* account,
+  void count(const FilterTable::Outcome& outcome) const;
+  WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& message);
+  void noteUserInfo(const SessionFacts& facts);
+  Sent batchEvent(WrittenEvent event, const NumberedMessage& message, platform::MemoryAccount* account,
                   std::uint64_t sessionIDChanges);
-  Sent postEvent(Dictionary event, const SessionFacts& facts, const NumberedMessage& message);
-  Dictionary refilled(const SessionFacts& facts, std::uint64_t batch) const;
+  Sent postEvent(WrittenEvent event, const SessionFacts& facts, const NumberedMessage& message);
+  // Merges the present user info into the events. False if there is no memory for it.
+  bool mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts, config::EditedFields& edits);
+  JSONMessage createMessage(std::vector<std::string> events, const SessionFacts& facts) const;
   ClientMatch clientMatch() const override { return _clientState.match(); }
-  // `eventBytes` is an upper bound on the events' JSON texts.
-  JSONMessage createMessage(std::vector<Dictionary> events, const SessionFacts& facts,
-                            std::size_t eventBytes) const;
+  // For the record of fates: what was changed in an event, and then by the user info of a flush.
+  void noteEdits(const SessionFacts& facts, const NumberedMessage& message,
+                 const config::EditedFields& edits) const;
+  void noteMerge(const SessionFacts& facts, const config::EditedFields& edits, std::uint64_t batch) const;
+  // For the history of what left, if one is kept: names of fields that the owner keeps back, too.
+  bool recorded() const;
+  void addOwnersEdits(const SessionFacts& facts, const MessageNote& note, config::EditedFields& edits) const;
+  Dictionary about(const SessionFacts& facts, const config::EditedFields& edits) const;
 
   platform::Locale& _locale;
   platform::Counters& _counters;
   EventPosts& _posts;
+  config::OwnerGate* const _gate;
 
   // The session's thread only.
   HTTPSPostState _clientState;
   // The batch is registered with the user's account.
   bool _evictable = false;
+  // With which the settled events of the batch were written.
+  SharedDictionary _writtenInfo;
+  FilterTable _writtenFilters;
+  // Of the last event; most of the next ones are about as long.
+  std::size_t _lastLength = 0;
+  // Of the events in the batch, and perhaps of some that were dropped from it.
+  config::EditedFields _batchEdits;
 
   const std::shared_ptr<HeldEvents> _held;
 };

@@ -37,10 +37,14 @@ class HTTPSPostState {
   StateVerdict updateBackendState();
 
   bool batchEvents(const SessionFacts& facts) const { return _batchEvents.value_or(facts.batchEvents); }
+  void renewIdentifiers() { _identity.renewIdentifiers(); }
+  void rereadConsent() { _identity.rereadConsent(); }
   const PostIdentity& identity() const { return _identity; }
   const PostLinks& links() const { return _links; }
   const FilterTable& filters() const { return _filters; }
   std::int32_t eventThreshold() const { return _eventThreshold; }
+  // The number of the client entry that holds; nothing: none does.
+  std::optional<std::size_t> entry() const { return _match.entry; }
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
   // Of the client entry that decides, or, if the session requires no user info, has given the address.
   const ClientMatch& match() const { return _match; }

@@ -1,35 +1,40 @@
 // SPDX-License-Identifier: Apache-2.0
-// Makes the JSON text that is posted, and its readable copy.
+// The JSON text that is posted, and its readable copy.
 #pragma once
 
+#include <cstddef>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
-
-#include "base/value.h"
 
 namespace veltrad::backends {
 
-// JSON cannot represent numbers that are not finite.
-double finiteOrMinusOne(double seconds);
+// {"clientId": text, "events": [...], "postTime": seconds since 1970}, in pieces, which need not be joined to
+// be compressed. A `postTime` that is not finite becomes -1.0.
+class PostText {
+ public:
+  // The events are JSON texts.
+  PostText(double postTime, const std::string& clientID, std::vector<std::string> events);
 
-// Changes an event in place so that JSON can represent it. A date becomes its seconds since 1970 (-1.0 if not
-// finite). Lists, dictionaries, raw bytes and numbers that are not finite are removed, each with a warning
-// line. Returns how many entries were removed.
-std::size_t restrictEventForJSON(Dictionary& event);
+  // Valid until the text is changed or moved.
+  std::vector<std::string_view> pieces() const;
+  std::size_t size() const { return _size; }
+  std::string joined() const;
+  // With each field on a line of its own.
+  std::string readable() const;
 
-// True if restrictEventForJSON would change nothing.
-bool fitsJSON(const Dictionary& event);
+ private:
+  std::string _begin;
+  std::vector<std::string> _events;
+  std::string _end;
+  std::size_t _size;
+};
 
 struct JSONMessage {
-  std::string compact;
+  PostText text;
   // Only if it was requested.
   std::optional<std::string> pretty;
 };
-
-// {"postTime": seconds since 1970, "clientId": text, "events": [...]}. The events have been restricted. A
-// `postTime` that is not finite becomes -1.0. `expectedBytes` as for writeJSON.
-JSONMessage makeJSONMessage(double postTime, const std::string& clientID, std::vector<Dictionary> events,
-                            bool wantPretty, std::size_t expectedBytes = 0);
 
 }  // namespace veltrad::backends

@@ -32,11 +32,22 @@ bool textMeansYes(const std::optional<std::string>& text) {
 PostIdentity::PostIdentity(const Sources& sources)
     : _preferences(sources.preferences),
       _settings(sources.settings),
-      _dnuEnabled(diagnosticLogSubmissionEnabled(_preferences)),
+      _library(sources.library),
       _forceEventLogging(textMeansYes(
           _preferences.text(platform::kVeltraPreferenceDomain, config::preference::kForceEventLogging))),
+      _dnuEnabled(diagnosticLogSubmissionEnabled(_preferences)),
       _uuidRespectDnu(sources.library.getPersistentIdentifierForDNU(true).value_or("")),
       _uuidOverrideDnu(sources.library.getPersistentIdentifierForDNU(false).value_or("")) {}
+
+void PostIdentity::renewIdentifiers() {
+  if (auto made = _library.getPersistentIdentifierForDNU(true)) _uuidRespectDnu = std::move(*made);
+  if (auto made = _library.getPersistentIdentifierForDNU(false)) _uuidOverrideDnu = std::move(*made);
+  _uuidCustom.reset();
+}
+
+void PostIdentity::rereadConsent() {
+  _dnuEnabled = diagnosticLogSubmissionEnabled(_preferences);
+}
 
 bool PostIdentity::takeCustomClientID(const std::optional<std::string>& clientName,
                                       const std::optional<std::string>& serviceName) {
@@ -65,7 +76,7 @@ const std::string& PostIdentity::clientIdentifier(const DeviceFacts& device) con
 bool PostIdentity::loggingAllowed() const {
   if (_dnuType == 0 && _dnuEnabled) return true;
   if (!_forceEventLogging) return false;
-  const auto environment = _settings.currentEnvironment();
+  const std::uint32_t environment = _settings.currentEnvironment().value_or(0);
   return environment == 1 || environment == 2;
 }
 

@@ -36,6 +36,11 @@ class PostIdentity {
   bool takeCustomClientID(const std::optional<std::string>& clientName,
                           const std::optional<std::string>& serviceName);
 
+  // Reads the identifiers anew; that of a client and service has to be taken again. Those that cannot be read
+  // just now stay.
+  void renewIdentifiers();
+  void rereadConsent();
+
   const std::string& clientIdentifier(const DeviceFacts& device) const;
   // Whether a readable copy of a post may be logged.
   bool loggingAllowed() const;
@@ -47,11 +52,12 @@ class PostIdentity {
   // Constant after construction.
   platform::Preferences& _preferences;
   config::ProcessSettings& _settings;
-  const bool _dnuEnabled;
+  const support::Veltra& _library;
   const bool _forceEventLogging;
-  const std::string _uuidRespectDnu;
-  const std::string _uuidOverrideDnu;
 
+  bool _dnuEnabled;
+  std::string _uuidRespectDnu;
+  std::string _uuidOverrideDnu;
   std::int32_t _dnuType = 0;
   std::int32_t _extrasOnInternal = 0;
   std::optional<std::string> _uuidCustom;

@@ -15,7 +15,7 @@ std::string orNull(const std::optional<std::string>& text) {
 }
 }  // namespace
 
-http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
+http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, const PostText& text,
                                   std::optional<EventMap> eventMap, BodyCompression compression) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
@@ -24,10 +24,9 @@ http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, st
   request.keepsAnswer = false;
 
   std::optional<std::string> compressed;
-  if (compression.level > 0) compressed = compression.gzip.gzipDeflate(json, compression.level);
-  const bool useCompressed = compressed && !compressed->empty() && compressed->size() < json.size();
-  request.body = useCompressed ? std::move(*compressed) : std::move(json);
-  request.body.shrink_to_fit();  // it may wait for a server for a long time
+  if (compression.level > 0) compressed = compression.gzip.gzipDeflate(text.pieces(), compression.level);
+  const bool useCompressed = compressed && !compressed->empty() && compressed->size() < text.size();
+  request.body = useCompressed ? std::move(*compressed) : text.joined();
 
   auto& headers = request.headers;
   if (const SharedDictionary& userInfo = facts.sentUserInfo) {

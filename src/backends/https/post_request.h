@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 
+#include "backends/https/json_message.h"
 #include "http/http_client.h"
 #include "support/gzip.h"
 #include "wire/reasons.h"
@@ -26,8 +27,8 @@ struct BodyCompression {
   int level;
 };
 
-// Compresses the JSON text if that makes it shorter. In "User-Agent", "(null)" stands for an absent text.
-http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, std::string json,
+// Compresses the text if that makes it shorter. In "User-Agent", "(null)" stands for an absent text.
+http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, const PostText& text,
                                   std::optional<EventMap> eventMap, BodyCompression compression);
 
 // What an answer's status means for the back end and for the posted events.

@@ -88,7 +88,7 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   auto file = fileToUpload(lent.get(), path);
   if (!file) return false;
   const auto facts = this->facts();
-  const auto place = _uploads.enter(userOf(facts->account), _http);
+  auto place = _uploads.enter(userOf(facts->account), _http, facts->client);
   if (!place) {
     sayStopping();
     return false;
@@ -103,6 +103,9 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   }
   gzipped.become(*request);
   notePost(*request);
+  request->client = facts->client;
+  request->about = aboutDeparture(name(), *facts, std::nullopt, {});
+  place->requests();
   if (confirms(_http.perform(std::move(*request)))) remove(*lent, *file, path);
   return true;
 }

@@ -41,6 +41,7 @@ std::optional<std::string> outputOf(const std::vector<std::string>& command, std
   if (::pipe2(ends, O_CLOEXEC) != 0) return std::nullopt;
   FileDescriptor reading(ends[0]), writing(ends[1]);
   std::vector<char*> arguments;
+  arguments.reserve(command.size() + 1);
   for (const std::string& argument : command) arguments.push_back(const_cast<char*>(argument.c_str()));
   arguments.push_back(nullptr);
   posix_spawn_file_actions_t actions;

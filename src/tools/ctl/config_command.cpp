@@ -20,8 +20,6 @@ namespace {
 using config::PreferenceKey;
 using Use = PreferenceAccess::Use;
 
-constexpr int kWrongUsage = 2;
-
 int refused(const std::string& why, int status = 1) {
   complain(why);
   return status;

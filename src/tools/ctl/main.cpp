@@ -1,10 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // veltractl: talks to veltrad through libveltra, like any client.
 #include <cstdio>
+#include <exception>
 
 #include "tools/ctl/config_command.h"
 #include "tools/ctl/doctor_command.h"
+#include "tools/ctl/history_command.h"
 #include "tools/ctl/options.h"
+#include "tools/ctl/privacy_command.h"
 #include "tools/ctl/refresh_command.h"
 #include "tools/ctl/report_command.h"
 #include "tools/ctl/send_command.h"
@@ -13,8 +16,10 @@
 #include "tools/ctl/status_command.h"
 #include "tools/ctl/why_command.h"
 
-int main(int argc, char** argv) {
-  using namespace veltrad::ctl;
+namespace veltrad::ctl {
+namespace {
+
+int run(int argc, char** argv) {
   const auto parsed = parseOptions(argc, argv);
   if (const auto* ending = std::get_if<Ending>(&parsed)) {
     std::fputs(ending->output.c_str(), stdout);
@@ -45,9 +50,30 @@ int main(int argc, char** argv) {
       return runWhy(options);
     case Command::watch:
       return runWatch(options, interrupt);
+    case Command::privacy:
+    case Command::privacyOff:
+    case Command::privacyOn:
+    case Command::privacyReset:
+      return runPrivacy(options);
+    case Command::history:
+    case Command::historyShow:
+    case Command::historyPurge:
+      return runHistory(options);
     case Command::session:
       return runSession(options, interrupt);
     default:
       return runOneCall(options, interrupt);
+  }
+}
+
+}  // namespace
+}  // namespace veltrad::ctl
+
+int main(int argc, char** argv) {
+  try {
+    return veltrad::ctl::run(argc, argv);
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "veltractl: %s\n", error.what());
+    return 1;
   }
 }

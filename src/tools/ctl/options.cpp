@@ -14,16 +14,16 @@
 #include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
 #include "tools/ctl/key_value.h"
+#include "tools/ctl/owner_options.h"
 #include "veltra/veltra.h"
 #include "wire/constants.h"
 
 namespace veltrad::ctl {
 namespace {
 
-constexpr int kWrongUsage = 2;
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
-    "metrics, doctor, config, refresh, report, why or watch";
+    "metrics, doctor, config, refresh, report, privacy, history, why or watch";
 
 // Arguments in text form.
 struct Texts {
@@ -293,6 +293,7 @@ void describe(CLI::App& app, Options& options, Texts& texts) {
   addQuestions(app, options, texts);
   addUploads(app, options, texts);
   addCare(app, options);
+  addOwner(app, options);
 }
 
 }  // namespace

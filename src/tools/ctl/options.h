@@ -14,6 +14,9 @@
 
 namespace veltrad::ctl {
 
+// The exit status of a command line that cannot be used.
+inline constexpr int kWrongUsage = 2;
+
 // The content of the session info. Absent values are left out.
 struct Identity {
   std::optional<std::int32_t> clientType;
@@ -43,6 +46,13 @@ enum class Command {
   configUnset,
   refresh,
   report,
+  privacy,
+  privacyOff,
+  privacyOn,
+  privacyReset,
+  history,
+  historyShow,
+  historyPurge,
   why,
   watch
 };
@@ -52,16 +62,19 @@ struct Care {
   bool watch = false;
   // doctor.
   std::vector<std::int32_t> clientTypes;
-  // config: a preference's name; refresh: a storebag's, empty for all.
+  // config: a preference's name; refresh: a storebag's, empty for all; history show: a record's.
   std::string key;
   std::string value;
   // report: the file to write.
   std::optional<std::string> output;
   bool yes = false;
+  // history show: the bytes as they left.
+  bool raw = false;
+  // history: the page to write.
+  std::optional<std::string> html;
   // why, watch.
   FateFilter fates;
   std::size_t last = 20;
-  bool contents = false;
 };
 
 // Its 13 fields are the command's options and arguments, by name.

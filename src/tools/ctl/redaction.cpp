@@ -18,7 +18,7 @@ namespace {
 
 constexpr const char* kLeftOut = "(left out)";
 // The library's matcher takes stack for each character.
-constexpr std::size_t kLongestLine = 4096;
+constexpr std::size_t kLongestShownLine = 4096;
 
 constexpr const char* kSecretWord =
     "(?:pass(?:word|wd|phrase)?|secret|token|api[_-]?key|authori[sz]ation|cookie|credential|private[_-]?key)"
@@ -95,7 +95,7 @@ std::string Redaction::text(std::string_view given) const {
 }
 
 std::string Redaction::line(std::string line) const {
-  if (line.size() > kLongestLine) line = line.substr(0, kLongestLine) + "(rest left out)";
+  if (line.size() > kLongestShownLine) line = line.substr(0, kLongestShownLine) + "(rest left out)";
   for (const Pattern& one : patterns()) line = std::regex_replace(line, one.pattern, one.instead);
   return withoutNames(std::move(line));
 }
@@ -126,7 +126,7 @@ Value Redaction::value(const Value& given) const {
   if (!dictionary) return given;
   std::vector<Dictionary::Entry> kept;
   for (const auto& [key, inner] : *dictionary) {
-    const bool secret = std::regex_search(key.substr(0, kLongestLine), kSecret);
+    const bool secret = std::regex_search(key.substr(0, kLongestShownLine), kSecret);
     kept.emplace_back(text(key), secret ? Value(kLeftOut) : value(inner));
   }
   return Dictionary::fromEntries(std::move(kept));

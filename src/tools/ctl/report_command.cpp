@@ -21,8 +21,6 @@ namespace veltrad::ctl {
 
 namespace {
 
-constexpr int kWrongUsage = 2;
-
 bool agreed(const std::string& file) {
   fmt::print(stderr, "Write this to {}? [y/N] ", file);
   std::fflush(stderr);

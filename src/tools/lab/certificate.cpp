@@ -22,7 +22,7 @@ using Certificate = Owned<X509, X509_free>;
 using Extension = Owned<X509_EXTENSION, X509_EXTENSION_free>;
 using Memory = Owned<BIO, BIO_free>;
 
-constexpr long kDay = 24 * 60 * 60;
+constexpr long kDay = 24L * 60 * 60;
 
 bool addExtension(X509* certificate, int kind, const char* value) {
   X509V3_CTX context;

@@ -5,6 +5,7 @@
 #include <unistd.h>
 #include <csignal>
 #include <cstdio>
+#include <exception>
 
 #include "directory.h"
 #include "formats/json.h"
@@ -59,9 +60,7 @@ int serve(const Directory& directory, const Options& options) {
   return 0;
 }
 
-}  // namespace
-
-int main(int argc, char** argv) {
+int run(int argc, char** argv) {
   Options options;
   CLI::App app;
   veltrad::lab::describe(app, options);
@@ -73,4 +72,15 @@ int main(int argc, char** argv) {
   const auto directory = Directory::open(options.path);
   if (!directory) return fail(directory.error());
   return serve(directory.value(), options);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  try {
+    return run(argc, argv);
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "veltra-lab: %s\n", error.what());
+    return 1;
+  }
 }

@@ -54,6 +54,8 @@ struct Rule {
 // Reads a rule. The error is one line that names the key and what was expected.
 Result<Rule, std::string> ruleFromJSON(std::string_view text);
 
+// Its draws are not seeded, so that every run gets the same numbers.
+// NOLINTNEXTLINE(cert-msc51-cpp)
 class Misbehaviour {
  public:
   // A rule for the same path replaces the earlier one.
@@ -76,7 +78,6 @@ class Misbehaviour {
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);
-  // Not seeded, so that every run draws the same numbers.
   std::minstd_rand _draw GUARDED_BY(_mutex);
   std::uint64_t _generation GUARDED_BY(_mutex) = 0;
   bool _stopped GUARDED_BY(_mutex) = false;

@@ -144,7 +144,7 @@ void Server::Library::route() {
     const int yes = 1;
     ::setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
   });
-  http.set_exception_handler([](const Request&, Response& response, std::exception_ptr) {
+  http.set_exception_handler([](const Request&, Response& response, const std::exception_ptr&) {
     refuse(response, 500, "the lab could not handle this request");
   });
   http.Get("/", [this](const Request&, Response& response) {

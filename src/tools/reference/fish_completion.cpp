@@ -10,7 +10,7 @@ namespace {
 using tools::Argument;
 using tools::CommandLine;
 
-std::string quoted(std::string_view text) {
+std::string fishQuoted(std::string_view text) {
   std::string result = "'";
   for (const char c : text) {
     if (c == '\'' || c == '\\') result += '\\';
@@ -29,21 +29,21 @@ std::string optionLine(const std::string& start, const Argument& argument) {
   std::string names;
   for (const std::string& name : argument.names)
     names += name.starts_with("--") ? " -l " + name.substr(2) : " -s " + name.substr(1);
-  return start + names + kindOf(argument.value) + " -d " + quoted(argument.help) + "\n";
+  return fmt::format("{}{}{} -d {}\n", start, names, kindOf(argument.value), fishQuoted(argument.help));
 }
 
 // Offered until one of them has been typed.
 std::string choicesLine(const std::string& complete, const std::string& condition, const Argument& argument) {
   const std::string choices = fmt::format("{}", fmt::join(argument.choices, " "));
   const std::string until = condition + "; and not __fish_seen_subcommand_from " + choices;
-  return fmt::format("{} -n {} -a {} -d {}\n", complete, quoted(until), quoted(choices),
-                     quoted(argument.help));
+  return fmt::format("{} -n {} -a {} -d {}\n", complete, fishQuoted(until), fishQuoted(choices),
+                     fishQuoted(argument.help));
 }
 
 // `condition` holds once the command has been typed.
 std::string linesOf(const CommandLine& line, const std::string& complete, const std::string& condition) {
   std::string lines;
-  const std::string start = condition.empty() ? complete : complete + " -n " + quoted(condition);
+  const std::string start = condition.empty() ? complete : complete + " -n " + fishQuoted(condition);
   for (const Argument& argument : line.arguments) {
     if (!argument.positional)
       lines += optionLine(start, argument);
@@ -57,9 +57,10 @@ std::string linesOf(const CommandLine& line, const std::string& complete, const 
   const std::string before = condition.empty() ? "" : condition + "; and ";
   for (const CommandLine& command : line.commands) {
     lines += fmt::format("{} -n {} -a {} -d {}\n", complete,
-                         quoted(before + "not __fish_seen_subcommand_from" + names), command.name,
-                         quoted(command.about));
-    lines += linesOf(command, complete, before + "__fish_seen_subcommand_from " + command.name);
+                         fishQuoted(fmt::format("{}not __fish_seen_subcommand_from{}", before, names)),
+                         command.name, fishQuoted(command.about));
+    lines +=
+        linesOf(command, complete, fmt::format("{}__fish_seen_subcommand_from {}", before, command.name));
   }
   return lines;
 }

@@ -11,7 +11,7 @@ using tools::Argument;
 using tools::CommandLine;
 
 // Within single quotes; `special` characters get a backslash.
-std::string quoted(std::string_view text, std::string_view special) {
+std::string zshQuoted(std::string_view text, std::string_view special) {
   std::string result;
   for (const char c : text) {
     if (c == '\'') {
@@ -35,12 +35,13 @@ std::string specOf(const Argument& argument) {
   const std::string value = argument.positional ? argument.names[0] : argument.value;
   if (argument.positional) {
     const char* form = argument.repeated ? "    '*:{}:{}' \\\n" : "    ':{}:{}' \\\n";
-    return fmt::format(fmt::runtime(form), quoted(value, ":"), action(value, argument));
+    return fmt::format(fmt::runtime(form), zshQuoted(value, ":"), action(value, argument));
   }
   std::string specs;
   for (const std::string& name : argument.names) {
-    specs += fmt::format("    '{}{}[{}]", argument.repeated ? "*" : "", name, quoted(argument.help, "[]:\\"));
-    if (!value.empty()) specs += fmt::format(":{}:{}", quoted(value, ":"), action(value, argument));
+    specs +=
+        fmt::format("    '{}{}[{}]", argument.repeated ? "*" : "", name, zshQuoted(argument.help, "[]:\\"));
+    if (!value.empty()) specs += fmt::format(":{}:{}", zshQuoted(value, ":"), action(value, argument));
     specs += "' \\\n";
   }
   return specs;
@@ -54,7 +55,7 @@ std::string functionsOf(const CommandLine& line, const std::string& name, const 
   for (const Argument& argument : line.arguments) specs += specOf(argument);
   for (const CommandLine& command : line.commands) {
     const std::string function = name + "_" + command.name;
-    names += fmt::format("    '{}:{}' \\\n", command.name, quoted(command.about, ":\\"));
+    names += fmt::format("    '{}:{}' \\\n", command.name, zshQuoted(command.about, ":\\"));
     calls += fmt::format("        {}) {} ;;\n", command.name, function);
     inner += functionsOf(command, function, everywhere.empty() ? specs : everywhere);
   }

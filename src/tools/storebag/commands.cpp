@@ -23,8 +23,6 @@
 namespace veltrad::storebag {
 namespace {
 
-using platform::DiskFileStore;
-
 Outcome done(std::string text) {
   return {true, std::move(text)};
 }

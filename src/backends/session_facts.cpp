@@ -1,0 +1,34 @@
+// SPDX-License-Identifier: Apache-2.0
+// Names a session's client.
+#include "backends/session_facts.h"
+
+#include <limits>
+
+#include "wire/constants.h"
+
+namespace veltrad::backends {
+
+SharedDictionary clientOf(const SessionFacts& facts) {
+  const auto textOrNull = [&facts](const char* key) {
+    const Dictionary* info = facts.sentUserInfo.get();
+    const std::string* text = info ? info->string(key) : nullptr;
+    return text ? Value(*text) : Value(std::numeric_limits<double>::quiet_NaN());
+  };
+  return std::make_shared<const Dictionary>(
+      Dictionary{{"clientType", facts.compType},
+                 {"sessionID", facts.sessionID},
+                 {"client", textOrNull(wire::kVeltraUserInfoClientName)},
+                 {"service", textOrNull(wire::kVeltraUserInfoServiceName)}});
+}
+
+Dictionary aboutDeparture(const std::string& backend, const SessionFacts& facts,
+                          std::optional<std::size_t> entry, const config::EditedFields& edits) {
+  const Value none = std::numeric_limits<double>::quiet_NaN();
+  return {{"backend", backend},
+          {"storebag", facts.storebag ? Value(*facts.storebag) : none},
+          {"entry", entry ? Value(*entry) : none},
+          {"removed", Array(edits.removed.begin(), edits.removed.end())},
+          {"hashed", Array(edits.hashed.begin(), edits.hashed.end())}};
+}
+
+}  // namespace veltrad::backends

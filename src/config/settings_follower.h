@@ -1,0 +1,73 @@
+// SPDX-License-Identifier: Apache-2.0
+// What a settings file says, read again when the file has changed. Any thread.
+#pragma once
+
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "base/mutex.h"
+#include "platform/local_settings.h"
+#include "platform/log.h"
+
+namespace veltrad::config {
+
+// Logged once the lock is released.
+struct SettingsLines {
+  std::vector<std::string> errors;
+  std::vector<std::string> warnings;
+
+  void log() const {
+    for (const std::string& line : errors) logError("%s", line.c_str());
+    for (const std::string& line : warnings) logWarning("%s", line.c_str());
+  }
+};
+
+// A shortage is no change: what held goes on.
+template <typename T>
+class SettingsFollower {
+ public:
+  // What a content means, which is decided once for each. `before`: what held until then.
+  using Meaning = std::shared_ptr<const T> (*)(const platform::LocalContent& content,
+                                               const std::shared_ptr<const T>& before, SettingsLines& lines);
+
+  // `path`: of either form. `first` holds until the file could be read. The store outlives it.
+  SettingsFollower(platform::FileStore& files, const std::string& path, Meaning meaning,
+                   std::shared_ptr<const T> first)
+      : _meaning(meaning), _file(files, path), _now(std::move(first)) {}
+
+  // What holds now; one object until that changes.
+  std::shared_ptr<const T> current() {
+    SettingsLines lines;
+    std::shared_ptr<const T> now;
+    {
+      const Lock held(_mutex);
+      auto content = _file.content();
+      if (content && content.value() != _content) {
+        _content = std::move(content).value();
+        _now = _meaning(*_content, _now, lines);
+      }
+      now = _now;
+    }
+    lines.log();
+    return now;
+  }
+  // The same, with the file read now, whether it has changed or not.
+  std::shared_ptr<const T> readAgain() {
+    {
+      const Lock held(_mutex);
+      _file.readAgain();
+    }
+    return current();
+  }
+
+ private:
+  const Meaning _meaning;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  platform::LocalSettings _file GUARDED_BY(_mutex);
+  std::shared_ptr<const platform::LocalContent> _content GUARDED_BY(_mutex);  // null before the first reading
+  std::shared_ptr<const T> _now GUARDED_BY(_mutex);
+};
+
+}  // namespace veltrad::config

@@ -1,0 +1,205 @@
+// SPDX-License-Identifier: Apache-2.0
+// Records what leaves.
+#include "support/history.h"
+
+#include <fmt/format.h>
+#include <openssl/evp.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <future>
+#include <iterator>
+
+#include "base/text.h"
+#include "formats/json.h"
+#include "platform/clock.h"
+#include "platform/file_store.h"
+#include "platform/log.h"
+
+namespace veltrad::support {
+
+namespace {
+
+constexpr std::size_t kMostJobBytes = 4096;
+constexpr std::int64_t kDaySeconds = 86'400;
+constexpr std::size_t kDigestPiece = 64u << 10;
+
+// Of the bytes of a file, or of a text. Nothing: the file cannot be read.
+std::optional<std::string> digestOf(std::string_view bytes, const FileDescriptor* file,
+                                    std::uint64_t fileBytes) {
+  const std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
+  unsigned char digest[EVP_MAX_MD_SIZE];
+  unsigned length = 0;
+  bool good = context && EVP_DigestInit_ex(context.get(), EVP_sha256(), nullptr) == 1 &&
+              EVP_DigestUpdate(context.get(), bytes.data(), bytes.size()) == 1;
+  std::string piece(file ? kDigestPiece : 0, '\0');
+  for (std::uint64_t at = 0; good && file && at < fileBytes;) {
+    const std::size_t most = std::min<std::uint64_t>(piece.size(), fileBytes - at);
+    const ssize_t got = ::pread(file->get(), piece.data(), most, static_cast<off_t>(at));
+    good = got > 0 && EVP_DigestUpdate(context.get(), piece.data(), static_cast<std::size_t>(got)) == 1;
+    at += static_cast<std::uint64_t>(std::max<ssize_t>(got, 0));
+  }
+  if (!good || EVP_DigestFinal_ex(context.get(), digest, &length) != 1) return std::nullopt;
+  return hex({reinterpret_cast<const char*>(digest), length});
+}
+
+// On the disk writer's thread: a file may be large.
+void putDigest(HistoryRecord& record) {
+  auto parsed = formats::parseJSON(record.header);
+  Dictionary header = *parsed.value().asDictionary();
+  header.setIfPresent("sha256", digestOf(record.body, record.file.get(), record.bodyBytes));
+  header.set("kept", false);
+  record.header = formats::writeJSON(header);
+  record.body.clear();
+  record.file.reset();
+  record.digestAlone = false;
+}
+
+std::string idOf(std::uint64_t number) {
+  return fmt::format("{:x}", number);
+}
+
+std::int64_t dayOf(std::uint64_t number) {
+  return static_cast<std::int64_t>(number / 1'000'000) / kDaySeconds;
+}
+
+}  // namespace
+
+History::History(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer)
+    : _clock(clock), _directory(std::move(directory)), _folder(_directory), _queue(writer, kMostJobBytes) {}
+
+void History::keep(std::optional<HistorySpace> space) {
+  const Lock held(_mutex);
+  _keeps.store(space.has_value(), std::memory_order_relaxed);
+  if (!space) return;
+  _space = *space;
+  _trimmedOn = 0;
+}
+
+// Microseconds since 1970, each number once.
+std::uint64_t History::nextNumber() {
+  const platform::TimeValue now = _clock.now();
+  const auto time = static_cast<std::uint64_t>(now.seconds * 1'000'000 + now.microseconds);
+  const Lock held(_mutex);
+  return _lastNumber = std::max(time, _lastNumber + 1);
+}
+
+std::uint64_t History::begins(Dictionary header, const Body& body) {
+  if (!keeps()) return 0;
+  const std::uint64_t number = nextNumber();
+  header.set("id", idOf(number));
+  header.set("time", static_cast<double>(number) / 1e6);
+  HistoryRecord record;
+  record.day = dayOf(number);
+  record.body = body.bytes;
+  record.file = body.file;
+  record.bodyBytes = body.file ? body.fileBytes : body.bytes.size();
+  {
+    const Lock held(_mutex);
+    record.digestAlone = record.bodyBytes > _space.bytes / kLargestShare;
+  }
+  record.header = formats::writeJSON(header);
+  put(std::move(record));
+  return number;
+}
+
+void History::ended(std::uint64_t number, Dictionary end) {
+  if (!keeps()) return;
+  end.set("end", idOf(number));
+  HistoryRecord record;
+  record.day = dayOf(nextNumber());
+  record.header = formats::writeJSON(end);
+  put(std::move(record));
+}
+
+void History::put(HistoryRecord record) {
+  const std::size_t bytes = record.waitingBytes();
+  std::size_t all = 0;
+  {
+    const Lock held(_mutex);
+    _waiting.push_back(std::move(record));
+    all = _waitingBytes.fetch_add(bytes, std::memory_order_relaxed) + bytes;
+  }
+  if (all > kMostBytes / 2) writeSoon();
+}
+
+void History::mend() {
+  static_cast<void>(_queue.put(
+      [this] {
+        static_cast<void>(platform::removeUnfinishedFiles(_directory));
+        if (const std::uint64_t cut = _folder.mend())
+          logWarning("The history of what left: %llu bytes of an unfinished record were cut off",
+                     static_cast<unsigned long long>(cut));
+      },
+      1));
+}
+
+void History::writeSoon() {
+  const std::int64_t today = _clock.now().seconds / kDaySeconds;
+  {
+    const Lock held(_mutex);
+    if (_waiting.empty() && (!keeps() || _trimmedOn == today)) return;
+  }
+  if (_asked.exchange(true)) return;
+  if (_queue.put([this] { write(); }, 1) != platform::DiskWriter::Queue::Put::taken) _asked = false;
+}
+
+void History::write() {
+  _asked = false;
+  std::vector<HistoryRecord> records;
+  HistorySpace space;
+  {
+    const Lock held(_mutex);
+    records.swap(_waiting);
+    space = _space;
+  }
+  std::size_t bytes = 0;
+  for (const HistoryRecord& record : records) bytes += record.waitingBytes();
+  for (HistoryRecord& record : records) {
+    if (record.digestAlone) putDigest(record);
+  }
+  const std::int64_t today = _clock.now().seconds / kDaySeconds;
+  std::string error;
+  const std::size_t written = _folder.append(records, error);
+  for (std::size_t i = written; i < records.size(); ++i) bytes -= records[i].waitingBytes();
+  if (!error.empty() && !_failed)
+    logError("The history of what left could not be written, and nothing more leaves: %s", error.c_str());
+  _failed = !error.empty();
+  if (keeps()) _folder.trim(space, today);
+  const Lock held(_mutex);
+  _waiting.insert(_waiting.begin(),
+                  std::make_move_iterator(records.begin() + static_cast<std::ptrdiff_t>(written)),
+                  std::make_move_iterator(records.end()));
+  _waitingBytes.fetch_sub(bytes, std::memory_order_relaxed);
+  _trimmedOn = today;
+}
+
+bool History::writeNow(std::chrono::steady_clock::time_point deadline) {
+  const auto done = std::make_shared<std::promise<void>>();
+  auto written = done->get_future();
+  using Put = platform::DiskWriter::Queue::Put;
+  const auto put = _queue.put(
+      [this, done] {
+        write();
+        done->set_value();
+      },
+      1);
+  return put == Put::taken && written.wait_until(deadline) == std::future_status::ready;
+}
+
+std::optional<HistoryFolder::Removed> History::purge(std::chrono::steady_clock::time_point deadline) {
+  const auto done = std::make_shared<std::promise<HistoryFolder::Removed>>();
+  auto removed = done->get_future();
+  using Put = platform::DiskWriter::Queue::Put;
+  const auto put = _queue.put(
+      [this, done] {
+        write();
+        done->set_value(_folder.purge());
+      },
+      1);
+  if (put != Put::taken || removed.wait_until(deadline) != std::future_status::ready) return std::nullopt;
+  return removed.get();
+}
+
+}  // namespace veltrad::support

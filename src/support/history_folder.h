@@ -1,0 +1,71 @@
+// SPDX-License-Identifier: Apache-2.0
+// The files of the history, one a day: appends, mends and removes. One thread at a time.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/file_descriptor.h"
+#include "base/result.h"
+
+namespace veltrad::support {
+
+// To be written. Its body is in `body` or, with `bodyBytes`, in `file`.
+struct HistoryRecord {
+  std::int64_t day = 0;  // since 1970, UTC
+  std::string header;    // JSON
+  std::string body;
+  std::shared_ptr<const FileDescriptor> file;
+  std::uint64_t bodyBytes = 0;
+  // The body is too large to be kept: the writer puts its digest into the header instead.
+  bool digestAlone = false;
+
+  std::size_t waitingBytes() const { return sizeof *this + header.size() + body.size(); }
+};
+
+// What the owner of the device allows it to take.
+struct HistorySpace {
+  std::int64_t days = 0;
+  std::uint64_t bytes = 0;
+};
+
+class HistoryFolder {
+ public:
+  struct Removed {
+    std::uint64_t records = 0;
+    std::uint64_t bytes = 0;
+    std::uint64_t days = 0;
+  };
+
+  explicit HistoryFolder(std::string directory) : _directory(std::move(directory)) {}
+
+  // Days that have a file, with its size.
+  static std::map<std::int64_t, std::uint64_t> days(const std::string& directory);
+  static std::string pathOf(const std::string& directory, std::int64_t day);
+  // "2026-11-26"; nothing: it is no day.
+  static std::string nameOf(std::int64_t day);
+  static std::optional<std::int64_t> dayNamed(std::string_view name);
+
+  // Cuts off what a killed daemon has left unfinished. Returns how many bytes that were.
+  std::uint64_t mend();
+  // Appends the records in order and syncs. Returns how many are on disk, whole; the others left no trace.
+  // The error is that of the first one that is not.
+  std::size_t append(const std::vector<HistoryRecord>& records, std::string& error);
+  // Removes the oldest records, until the rest is within the space.
+  void trim(const HistorySpace& space, std::int64_t today);
+  Removed purge();
+
+ private:
+  Result<Done, std::string> appendTo(std::int64_t day, const HistoryRecord* first, const HistoryRecord* last);
+  void shorten(std::int64_t day, std::uint64_t bytes);
+  void remove(std::int64_t day);
+
+  const std::string _directory;
+};
+
+}  // namespace veltrad::support

@@ -1,0 +1,94 @@
+// SPDX-License-Identifier: Apache-2.0
+// Asks for page after page, and joins the two records of what left.
+#include "tools/ctl/history_client.h"
+
+#include <limits>
+#include <map>
+
+#include "wire/names.h"
+
+namespace veltrad::ctl {
+
+namespace {
+
+constexpr std::chrono::seconds kPatience{30};
+constexpr const char* kKeys[] = {"id",      "time",       "kind",      "to",      "bytes",
+                                 "events",  "clientType", "sessionID", "client",  "service",
+                                 "backend", "storebag",   "entry",     "removed", "hashed"};
+constexpr const char* kEndKeys[] = {"status", "error", "transmissions"};
+
+Value orNull(const Dictionary& from, const char* key) {
+  const Value* value = from.find(key);
+  return value ? *value : Value(std::numeric_limits<double>::quiet_NaN());
+}
+
+HistoryItem itemOf(const Dictionary& record) {
+  HistoryItem item;
+  for (const char* key : kKeys) item.facts.set(key, orNull(record, key));
+  for (const char* key : {"status", "error"}) item.facts.set(key, orNull({}, key));
+  item.facts.set("transmissions", 1);
+  const Array* headers = record.array("headers");
+  if (headers) item.headers = *headers;
+  item.day = orNull(record, "day");
+  item.offset = orNull(record, "offset");
+  const std::string* digest = record.string("sha256");
+  if (digest) item.digest = *digest;
+  if (!record.boolean("kept").value_or(true)) {
+    item.facts.set("kept", false);
+    item.facts.set("sha256", orNull(record, "sha256"));
+    if (!digest) item.digest = "unknown";
+  }
+  return item;
+}
+
+}  // namespace
+
+std::string HistoryItem::text(const char* key) const {
+  const std::string* found = facts.string(key);
+  return found ? *found : std::string();
+}
+
+Result<std::vector<HistoryItem>, std::string> askForHistory(ControlClient& daemon) {
+  std::vector<HistoryItem> items;
+  std::map<std::string, std::size_t> places;
+  Dictionary next;
+  do {
+    auto page = daemon.ask(wire::question::kHistory, next, kPatience);
+    if (!page) return Failure{page.error()};
+    const Array* records = page.value().array("records");
+    for (const Value& one : records ? *records : Array()) {
+      const Dictionary* record = one.asDictionary();
+      const std::string* id = record ? record->string("id") : nullptr;
+      const std::string* end = record ? record->string("end") : nullptr;
+      if (id) {
+        places[*id] = items.size();
+        items.push_back(itemOf(*record));
+      } else if (const auto begun = end ? places.find(*end) : places.end(); begun != places.end()) {
+        for (const char* key : kEndKeys) items[begun->second].facts.set(key, orNull(*record, key));
+      }
+    }
+    const Dictionary* following = page.value().dictionary("next");
+    next = following ? *following : Dictionary();
+  } while (!next.empty());
+  return items;
+}
+
+Result<std::string, std::string> askForBody(ControlClient& daemon, const HistoryItem& item) {
+  std::string body;
+  for (;;) {
+    const auto answer =
+        daemon.ask(wire::question::kHistoryBody,
+                   {{"day", item.day}, {"offset", item.offset}, {"from", body.size()}}, kPatience);
+    if (!answer) return Failure{answer.error()};
+    const Value* bytes = answer.value().find("bytes");
+    const Value* size = answer.value().find("size");
+    const Data* piece = bytes ? bytes->asData() : nullptr;
+    const auto all = size ? size->toInt64() : std::nullopt;
+    if (!piece || !all) return Failure{std::string("veltrad answered without the bytes.")};
+    body += piece->bytes;
+    if (body.size() >= static_cast<std::size_t>(*all)) return body;
+    if (piece->bytes.empty()) return Failure{std::string("The record was removed meanwhile.")};
+  }
+}
+
+}  // namespace veltrad::ctl

@@ -1,0 +1,140 @@
+// SPDX-License-Identifier: Apache-2.0
+// The history of what left, on a real disk: whole over kills, within its bounds, and never without its
+// record.
+#include "support/history.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "fakes/machine.h"
+#include "fakes/recorded_log.h"
+#include "fakes/temporary_directory.h"
+#include "support/history_file.h"
+
+namespace veltrad {
+namespace {
+
+using namespace std::chrono_literals;
+using support::HistoryFile;
+using support::HistoryFolder;
+
+class HistoryTest : public ::testing::Test {
+ protected:
+  std::string path(std::int64_t day) const { return HistoryFolder::pathOf(_history->directory(), day); }
+  std::int64_t today() const { return _clock.now().seconds / 86'400; }
+  bool write() { return _history->writeNow(std::chrono::steady_clock::now() + 20s); }
+  std::uint64_t add(const std::string& body) {
+    return _history->begins({{"n", ++_count}}, {body, nullptr, 0});
+  }
+  // The numbers and bodies of the records in a day's file.
+  std::vector<std::pair<int, std::string>> records(std::int64_t day) const {
+    std::vector<std::pair<int, std::string>> found;
+    const HistoryFile file(path(day));
+    for (auto place = file.at(0); place; place = file.at(place->end())) {
+      EXPECT_TRUE(file.isIntact(*place));
+      const auto header = file.header(*place);
+      found.emplace_back(header ? header->int32("n").value_or(0) : -1, file.body(*place, 0, 1u << 20));
+    }
+    return found;
+  }
+  void restart() {
+    _history.emplace(_clock, _directory.path() + "/history", _writer);
+    _history->keep(_space);
+    _history->mend();
+  }
+  void SetUp() override { restart(); }
+
+  TemporaryDirectory _directory;
+  FakeClock _clock;
+  platform::DiskWriter _writer;
+  support::HistorySpace _space{7, 1u << 20};
+  std::optional<support::History> _history;
+  int _count = 0;
+};
+
+TEST_F(HistoryTest, CutsOffWhatAKillLeftUnfinishedAndGoesOn) {
+  add("first");
+  _history->ended(add(std::string(3000, 'x')), {{"n", 3}});
+  ASSERT_TRUE(write());
+  const auto whole = records(today());
+  ASSERT_EQ(whole.size(), 3u);
+  EXPECT_EQ(std::filesystem::status(path(today())).permissions(), std::filesystem::perms(0600));
+  const auto size = std::filesystem::file_size(path(today()));
+  RecordedLog log;
+  for (const std::size_t torn : {1u, 4u, 30u, 300u}) {
+    std::filesystem::resize_file(path(today()), size);
+    std::ofstream(path(today()), std::ios::app) << std::string(torn, '\0');
+    log.expectLine(RecordedLog::Level::warning, std::to_string(torn) + " bytes of an unfinished record");
+    restart();
+    ASSERT_TRUE(write());
+    EXPECT_EQ(records(today()), whole) << torn;
+  }
+  const std::uintmax_t lost = 20;
+  std::filesystem::resize_file(path(today()), size - lost);
+  log.expectLine(RecordedLog::Level::warning, "of an unfinished record");
+  restart();
+  add("next");
+  ASSERT_TRUE(write());
+  const auto now = records(today());
+  ASSERT_EQ(now.size(), 3u);
+  EXPECT_EQ(now[1], whole[1]);
+  EXPECT_EQ(now[2].second, "next");
+}
+
+TEST_F(HistoryTest, KeepsTheNewestWithinItsBytesAndDays) {
+  _space = {2, 65'536};
+  restart();
+  for (int day = 0; day < 3; ++day) {
+    for (int i = 0; i < 30; ++i) {
+      add(std::string(4000, static_cast<char>('a' + i)));
+      ASSERT_TRUE(write());
+      const auto days = HistoryFolder::days(_history->directory());
+      std::uint64_t bytes = 0;
+      for (const auto& [name, size] : days) bytes += size;
+      EXPECT_LE(bytes, _space.bytes);
+      EXPECT_GE(bytes, i < 15 && day == 0 ? 0 : _space.bytes * 3 / 4);
+      EXPECT_LE(days.size(), 2u);
+      EXPECT_EQ(records(today()).back().first, _count);
+    }
+    _clock.advance(86'400);
+  }
+  const auto removed = _history->purge(std::chrono::steady_clock::now() + 20s);
+  ASSERT_TRUE(removed);
+  EXPECT_GT(removed->records, 10u);
+  EXPECT_TRUE(HistoryFolder::days(_history->directory()).empty());
+}
+
+TEST_F(HistoryTest, ALargeBodyIsKeptAsItsDigest) {
+  _space.bytes = 65'536;
+  restart();
+  add(std::string(16'384, 'x'));
+  add(std::string(16'385, 'x'));
+  ASSERT_TRUE(write());
+  const HistoryFile file(path(today()));
+  const auto first = file.at(0);
+  const auto header = file.header(*file.at(first->end()));
+  EXPECT_EQ(first->bodyBytes, 16'384u);
+  EXPECT_EQ(header->boolean("kept"), false);
+  EXPECT_EQ(*header->string("sha256"), "39061532d423f2d385027b9d40fc07e2bedf7bf3151e8f8bdd5ff005cd5136d1");
+}
+
+TEST_F(HistoryTest, WhatTheDiskDoesNotTakeWaitsAndLeavesNoRoom) {
+  RecordedLog log;
+  log.expectLine(RecordedLog::Level::error, "could not be written, and nothing more leaves");
+  _space.bytes = 16u << 20;
+  restart();
+  _directory.write("history", "in the way");
+  while (_history->hasRoom()) add(std::string(1u << 20, 'x'));
+  EXPECT_EQ(_count, 4);
+  ASSERT_TRUE(write());
+  EXPECT_FALSE(_history->hasRoom());
+  std::filesystem::remove(_history->directory());
+  ASSERT_TRUE(write());
+  EXPECT_TRUE(_history->hasRoom());
+  EXPECT_EQ(records(today()).size(), 4u);
+}
+
+}  // namespace
+}  // namespace veltrad
