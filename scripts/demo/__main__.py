@@ -10,6 +10,7 @@ import threading
 import call
 import family
 import upload
+import why
 from stage import Daemon, Lab, Root, heading, program, wait_until
 
 ACTS = (call, family, upload)
@@ -52,6 +53,7 @@ def main():
         try:
             problems = [problem for act in ACTS for problem in act.show(root, lab, daemon)]
             show_stats(root)
+            problems += why.show(root)
             heading("\n".join(problems) or "Everything that should arrive has arrived, and nothing else.")
             if sys.stdin.isatty() and sys.stdout.isatty() and "--once" not in sys.argv:
                 daemon.allow("<")  # the user may try anything

@@ -5,6 +5,7 @@
 #include <openssl/evp.h>
 
 #include <cstdlib>
+#include <limits>
 #include <utility>
 
 #include "base/text.h"
@@ -32,8 +33,48 @@ Sent VeltraBackend::sendMessage(std::optional<Dictionary> payload, platform::Tim
   return sendNumberedMessage({std::move(payload), timestamp, method, respCode, _eventID, flag, note});
 }
 
-Sent VeltraBackend::sendNumberedMessage(NumberedMessage&&) {
-  return {};
+Sent VeltraBackend::sendNumberedMessage(NumberedMessage&& message) {
+  return settled(message, wire::Decision());
+}
+
+wire::StepEntry VeltraBackend::stepOf(const NumberedMessage& message) {
+  wire::StepEntry step;
+  step.message = message.note.number;
+  step.time = platform::FateRing::microseconds(message.timestamp);
+  step.eventNumber = message.eventID;
+  if (_pen.writes()) step.standing = _standing.of(_pen, standing());
+  return step;
+}
+
+Sent VeltraBackend::settled(const NumberedMessage& message, wire::Decision decision) {
+  static constexpr std::pair<wire::Fate, wire::Step> kSteps[] = {
+      {wire::Fate::none, wire::Step::none},
+      {wire::Fate::dropped, wire::Step::dropped},
+      {wire::Fate::written, wire::Step::written},
+      {wire::Fate::delivered, wire::Step::delivered}};
+  for (const auto& [fate, step] : kSteps) {
+    if (_pen.writes() && fate == decision.fate) _pen.write(step, decision.reason, stepOf(message));
+  }
+  return {decision, std::nullopt};
+}
+
+wire::StandingEntry VeltraBackend::standing() const {
+  const StateVerdict verdict = stateVerdict();
+  const ClientMatch match = clientMatch();
+  const auto place = [](const std::optional<std::size_t>& at) {
+    return at ? static_cast<std::int32_t>(*at) : -1;
+  };
+  wire::StandingEntry entry;
+  entry.backend = _pen.backend();
+  entry.state = static_cast<std::uint8_t>(verdict.state);
+  entry.reason = static_cast<std::uint8_t>(verdict.reason);
+  entry.differs = static_cast<std::uint8_t>((match.clientDiffers ? wire::StandingEntry::clientDiffers : 0) |
+                                            (match.serviceDiffers ? wire::StandingEntry::serviceDiffers : 0));
+  entry.entry = place(match.entry);
+  entry.nearest = place(match.nearest);
+  entry.draw = _samplingFactor;
+  entry.threshold = samplingThreshold().value_or(std::numeric_limits<double>::quiet_NaN());
+  return entry;
 }
 
 // Back ends that override it keep the completion, hence by value.
@@ -43,7 +84,7 @@ std::optional<std::string> VeltraBackend::flushMessagesWithCompletion(FlushCompl
   return std::nullopt;
 }
 
-bool VeltraBackend::uploadFileAtPath(const std::string&, const std::string&) {
+bool VeltraBackend::uploadFileAtPath(const std::string&, const std::string&, const MessageNote&) {
   return false;
 }
 

@@ -12,12 +12,15 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/client_match.h"
 #include "backends/lock_ranks.h"
 #include "backends/session_facts.h"
+#include "backends/standing_record.h"
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
+#include "platform/fate_pen.h"
 #include "platform/random.h"
 #include "wire/error.h"
 #include "wire/fates.h"
@@ -58,6 +61,10 @@ struct Sent {
 struct MessageNote {
   // What the owner keeps back of the payload; null: nothing. Valid during the call.
   const config::EditedFields* edits = nullptr;
+  // In the record of fates; 0: it is in none.
+  std::uint64_t number = 0;
+  // Where the record tells of its session.
+  wire::FateRef session = 0;
 };
 
 struct NumberedMessage {
@@ -71,7 +78,8 @@ struct NumberedMessage {
   MessageNote note = {};
 };
 
-// One back end of one session. It outlives its session only while its own work is under way.
+// One back end of one session. It outlives its session only while its own work is under way. Its 15 fields
+// are what every kind has: what it is, how it stands, what it knows of its session, and what is told of it.
 class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  public:
   // Gets an optional result text and an optional error. Called exactly once, possibly on another thread.
@@ -95,7 +103,8 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual Sent sendNumberedMessage(NumberedMessage&& message);
   // By default completes at once without a text or an error. `completion` may be empty.
   virtual std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion);
-  virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken);
+  virtual bool uploadFileAtPath(const std::string& path, const std::string& extensionToken,
+                                const MessageNote& note);
   virtual bool uploadLogData(const Array& logData, const MessageNote& note);
   virtual void setCorrelatedSessionID(const std::string& sessionID);
   // The device has another identifier, and the back end makes others of its own.
@@ -111,6 +120,9 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // In [0, 1), drawn once.
   double samplingFactor() const { return _samplingFactor; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
+  // Called before the first message: what becomes of messages is written there. Null: nowhere.
+  void keepFates(platform::FateRing* ring) { _pen = {ring, _name}; }
+  const platform::FatePen& pen() const { return _pen; }
 
   // Any thread. Never null; a change of the facts does not affect those that a caller already has.
   SharedFacts facts() const;
@@ -151,16 +163,26 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Draws the sampling factor.
   VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
+  // The session's thread.
+  virtual ClientMatch clientMatch() const { return {}; }
+  // What the record is to say of a step of the message, with how the back end stands. The session's thread.
+  wire::StepEntry stepOf(const NumberedMessage& message);
+  // Writes down a decision after which nothing more becomes of the message here.
+  Sent settled(const NumberedMessage& message, wire::Decision decision);
 
  private:
+  wire::StandingEntry standing() const;
+
   // Constant after construction.
   const std::string _name;
   const std::string _productFamily;
   const double _samplingFactor;
   std::optional<std::string> _displayURL;
+  platform::FatePen _pen;
 
   // The session's thread only.
   std::uint16_t _eventID = 0;
+  StandingRecord _standing;
 
   std::atomic<StateVerdict> _state{StateVerdict()};
   std::atomic<int> _prohibition{-1};  // a reason; negative: none

@@ -33,7 +33,9 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
     const SharedFacts& facts, bool oneShot) {
   auto made = make(name, profile, productFamily, *facts, oneShot);
-  if (made) made->setFacts(facts);
+  if (!made) return nullptr;
+  made->setFacts(facts);
+  made->keepFates(_services.fates);
   return made;
 }
 
@@ -48,9 +50,10 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
   platform::Random& random = stable ? fixed : _services.random;
 #ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
-    return DashboardBackend::initWithName({random, _services.clock, _services.counters, _services.pool,
-                                           _logData, _dashboards, facts.account, oneShot, _services.gate},
-                                          name, std::get_if<config::DashboardProfile>(profile.get()), family);
+    return DashboardBackend::initWithName(
+        {random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, facts.account,
+         oneShot, _services.gate, _services.fates},
+        name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
 #endif
   if (name == wire::kVeltraBackendUploadServer) {
@@ -64,6 +67,7 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
          _services.locale,
          _services.counters,
          _posts,
+         {_services.fates, name},
          {_services.preferences, _services.library, _services.settings},
          _services.gate},
         name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
@@ -80,6 +84,19 @@ std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, con
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());
   _services.counters.count(wire::Reason::unknown_backend);
   return nullptr;
+}
+
+wire::Reason BackendFactory::whyNotMade(std::string_view name) {
+  static constexpr std::pair<const char*, wire::Reason> kReasons[] = {
+      {wire::kVeltraBackendDashboard, wire::Reason::bad_address},
+      {wire::kVeltraBackendUploadServer, wire::Reason::no_post_url},
+      {wire::kVeltraBackendHTTPPost, wire::Reason::no_clients},
+      {wire::kVeltraBackendHTTPPost2, wire::Reason::no_clients},
+      {wire::kVeltraBackendMivo, wire::Reason::client_type_not_served}};
+  for (const auto& [kind, reason] : kReasons) {
+    if (kind == name) return reason;
+  }
+  return wire::Reason::unknown_backend;
 }
 
 }  // namespace veltrad::backends

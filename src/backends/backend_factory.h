@@ -30,7 +30,7 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 17 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 18 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -53,6 +53,8 @@ struct BackendServices {
   SamplingFactors* sampling = nullptr;
   // Null: the owner sets no limits.
   config::OwnerGate* gate = nullptr;
+  // Null: what becomes of messages is not recorded.
+  platform::FateRing* fates = nullptr;
 };
 
 // A back end's section of a storebag. Null for a back end that reads no section.
@@ -69,6 +71,8 @@ class BackendFactory {
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
                                                     const SharedFacts& facts, bool oneShot = false);
+  // The one reason for which a kind of back end is not made, other than that something was short.
+  static wire::Reason whyNotMade(std::string_view name);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest() { _posts.sayRest(); }
   // Frees memory that is kept for the next message. Called when nothing was sent for a while.

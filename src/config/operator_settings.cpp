@@ -46,9 +46,14 @@ constexpr std::array kStorebagChoiceKeys{
 };
 
 constexpr std::array kFatesKeys{
-    later("bytes", integer, kBytes, "524288", "Size of the ring that keeps what became of messages."),
+    row<&FatesChoices::bytes>({"bytes",
+                               integer,
+                               {64 << 10, 256 << 20},
+                               optional,
+                               "524288",
+                               "Size of the ring that keeps what became of messages. Read at start."})
+        .key,
 };
-constexpr KeyTable kFatesTable{kFatesKeys};
 
 constexpr std::array kSpoolKeys{
     later("bytes", integer, kBytes, "no spool", "Bytes of failed posts that are kept on disk."),
@@ -83,7 +88,9 @@ constexpr std::array kSettingsKeys{
                                       "What is done with storebags.", &StorebagChoices::kKeys})
         .key,
     later("keys", texts, kUnbounded, "publicKey.der alone", "Files of further public keys under keys/."),
-    later("fates", kFatesTable, "as its keys say", "The record of what became of messages."),
+    row<&OperatorChoices::fates>({"fates", dictionary, kUnbounded, optional, "as its keys say",
+                                  "The record of what became of messages.", &FatesChoices::kKeys})
+        .key,
     later("spool", kSpoolTable, "no spool", "Failed posts are kept on disk and sent again."),
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
                                         "How event posts are compressed.", &CompressionChoices::kKeys})
@@ -94,11 +101,16 @@ constexpr std::array kSettingsKeys{
 }  // namespace
 
 constinit const KeyTable StorebagChoices::kKeys{kStorebagChoiceKeys};
+constinit const KeyTable FatesChoices::kKeys{kFatesKeys};
 constinit const KeyTable CompressionChoices::kKeys{kCompressionKeys};
 constinit const KeyTable OperatorChoices::kKeys{kSettingsKeys};
 
 void take(const Key&, const Value& value, StorebagChoices& field) {
   if (const Dictionary* dictionary = value.asDictionary()) field = parsed<StorebagChoices>(*dictionary);
+}
+
+void take(const Key&, const Value& value, FatesChoices& field) {
+  if (const Dictionary* dictionary = value.asDictionary()) field = parsed<FatesChoices>(*dictionary);
 }
 
 void take(const Key&, const Value& value, CompressionChoices& field) {

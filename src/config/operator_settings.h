@@ -27,6 +27,14 @@ struct CompressionChoices {
 };
 void take(const Key& key, const Value& value, CompressionChoices& field);
 
+// "fates".
+struct FatesChoices {
+  std::int32_t bytes = 512 << 10;  // of the ring
+
+  static const KeyTable kKeys;
+};
+void take(const Key& key, const Value& value, FatesChoices& field);
+
 // How a back end comes by its sampling factor.
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
@@ -36,6 +44,7 @@ void take(const Key& key, const Value& value, Sampling& field);
 struct OperatorChoices {
   Sampling sampling = Sampling::drawn;
   StorebagChoices storebags;
+  FatesChoices fates;
   CompressionChoices compression;
 
   static const KeyTable kKeys;

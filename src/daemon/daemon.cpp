@@ -4,22 +4,30 @@
 
 namespace veltrad::daemon {
 
+namespace {
+std::size_t bytesForFates(config::OperatorSettings& settings) {
+  const auto choices = settings.current();
+  return static_cast<std::size_t>((choices ? *choices : config::OperatorChoices()).fates.bytes);
+}
+}  // namespace
+
 Daemon::Daemon(Services& services)
     : _services(services),
       _library(services.files, services.preferences, services.root),
       _device(services.device),
       _settings(services.preferences, _device, services.files, services.root.deploymentPath()),
       _choices(services.files, services.root.settingsPath()),
+      _fates(bytesForFates(_choices), services.clock),
       _sampling(_choices, services.secret),
       _messageLog(services.clock, services.root.messageLogDirectory(), services.writer, services.counters),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _choices, _device,
                 _library, services.pool, services.lentFiles, services.root.preferencesDirectory(), &_sampling,
-                &services.gate}),
+                &services.gate, &_fates}),
       _storebagStore(services.files, services.clock, services.root.storebagsDirectory()),
       _storebags(services.http, _settings, _library, _choices, _storebagStore, services.counters),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
-              services.counters, _flushes, _messageLog, services.gate},
+              services.counters, _flushes, _messageLog, services.gate, &_fates},
              _storebags, services.transaction),
       _privacy(services, _agent, _factory, _library) {}
 

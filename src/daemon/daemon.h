@@ -11,6 +11,7 @@
 #include "daemon/privacy.h"
 #include "daemon/services.h"
 #include "daemon/veltrad_agent.h"
+#include "platform/fate_ring.h"
 #include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
@@ -19,7 +20,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 13 fields are these objects, in the order in which they need each other.
+// 14 fields are these objects, in the order in which they need each other.
 class Daemon {
  public:
   explicit Daemon(Services& services);
@@ -30,6 +31,7 @@ class Daemon {
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
+  const platform::FateRing& fates() const { return _fates; }
 
  private:
   Services& _services;
@@ -37,6 +39,7 @@ class Daemon {
   support::DeviceIdentity _device;
   config::ProcessSettings _settings;
   config::OperatorSettings _choices;
+  platform::FateRing _fates;
   backends::SamplingFactors _sampling;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;

@@ -156,7 +156,8 @@ bool Families::ancestorAggregates(const session::FamilyPlace& place) {
 session::CopySent Families::sendToAncestor(const session::FamilyPlace& place, std::string_view copy) {
   const Lock held(_lock);
   const FamilyMember* ancestor = ancestorWithAggregator(place);
-  return ancestor ? ancestor->facts.aggregation->sendToAggregator(copy) : session::CopySent();
+  return ancestor ? ancestor->facts.aggregation->sendToAggregator(copy, ancestor->facts.sessionIDString)
+                  : session::CopySent();
 }
 
 void Families::updateCombinedSessionID(const FamilyMember& member) const {

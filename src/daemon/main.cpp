@@ -293,7 +293,8 @@ int main(int count, char** arguments) {
                           services.counters, services.memory, services.root.entitlementsPath()},
                          daemon.agent());
   daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
-  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), started);
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
+                              started);
   ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
                          services.counters, services.observersMemory, services.root.entitlementsPath(),
                          kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},

@@ -42,6 +42,7 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kSetConfig, Right::control, &Observers::setPreference},
       {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
       {question::kRefresh, Right::control, &Observers::refresh},
+      {question::kFates, Right::observe, &Observers::fates},
       {question::kPrivacy, Right::control, &Observers::privacy},
       {question::kTurnReportingOff, Right::control, &Observers::turnReportingOff},
       {question::kTurnReportingOn, Right::control, &Observers::turnReportingOn},
@@ -103,12 +104,13 @@ class Observers::Desk final : public ipc::Observer {
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
-                     Privacy& privacy, double started)
+                     Privacy& privacy, const platform::FateRing& fates, double started)
     : _services(services),
       _agent(agent),
       _clients(clients),
       _doctor(doctor),
       _privacy(privacy),
+      _fates(fates),
       _started(started),
       _preferences(services.preferences, services.device) {}
 
@@ -174,6 +176,22 @@ Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection
     types.push_back(*type);
   }
   return _doctor.examine(caller, _agent.storebags(), types);
+}
+
+// The entries from a position on, as they lie in the ring.
+Observers::Answer Observers::fates(const Dictionary& arguments) {
+  // They and the rest of the answer stay below a frame's bound.
+  constexpr std::size_t kMost = 8192;
+  const Value* from = arguments.find("from");
+  const auto position = from ? from->toInt64() : std::nullopt;
+  if (!position || *position < 0) return Failure{std::string("argument \"from\" must be a position")};
+  const std::uint64_t messages = _fates.messages();
+  platform::FateRing::Copy copy =
+      _fates.copy(static_cast<std::uint64_t>(*position), kMost, arguments.boolean("patient").value_or(true));
+  return Dictionary{{"layout", wire::kFateLayout}, {"entries", Data{std::move(copy.entries)}},
+                    {"next", copy.next},           {"missing", copy.missing},
+                    {"end", _fates.next()},        {"messages", messages},
+                    {"size", _fates.size()},       {"refresh", _fates.refresh()}};
 }
 
 Observers::Answer Observers::history(const Dictionary& arguments) {

@@ -12,6 +12,7 @@
 #include "daemon/privacy.h"
 #include "daemon/services.h"
 #include "ipc/connection.h"
+#include "platform/fate_ring.h"
 
 namespace veltrad::ipc {
 class Listener;
@@ -28,7 +29,7 @@ class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
   Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
-            double started);
+            const platform::FateRing& fates, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -54,6 +55,7 @@ class Observers final : public ipc::ListenerDelegate {
   Answer unsetPreference(const Dictionary& arguments);
   Answer refresh(const Dictionary& arguments);
   Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
+  Answer fates(const Dictionary& arguments);
   Answer privacy(const Dictionary&) { return _privacy.show(); }
   Answer turnReportingOff(const Dictionary&) { return _privacy.turnOff(); }
   Answer turnReportingOn(const Dictionary&) { return _privacy.turnOn(); }
@@ -68,6 +70,7 @@ class Observers final : public ipc::ListenerDelegate {
   ipc::Listener& _clients;
   Doctor& _doctor;
   Privacy& _privacy;
+  const platform::FateRing& _fates;
   const double _started;
   config::PreferenceEditor _preferences;
 };

@@ -267,6 +267,11 @@ void CurlHTTPClient::Impl::end(Transfers one, HTTPResult result) {
 void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
   try {
     gate.ended(one.front(), result);
+    if (!result) {
+      HTTPError error = result.error();
+      error.begun = one.front().hasBegun();
+      result = Failure{std::move(error)};
+    }
     record(one.front().host(), result);
     one.front().complete(std::move(result));
   } catch (const std::bad_alloc&) {

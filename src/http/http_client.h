@@ -94,6 +94,15 @@ struct HTTPError {
   Cause cause = Cause::other;
   // Of one that was refused.
   std::optional<wire::Reason> refusal = std::nullopt;
+  // The request had begun when it ended so.
+  bool begun = false;
+
+  // False: nothing of the request has left the device.
+  bool mayHaveArrived() const {
+    const bool ended = kind == Kind::refused || kind == Kind::stopping;
+    return ended ? begun && refusal != wire::Reason::over_daily_limit
+                 : kind != Kind::tooMany && kind != Kind::shortage;
+  }
 };
 
 // What the request keeps until its completion has run, including libcurl's copies, without the completion

@@ -14,10 +14,11 @@ void Aggregation::setActive(bool active) {
   _active.store(active, std::memory_order_relaxed);
 }
 
-CopySent Aggregation::sendToAggregator(std::string_view copy) {
+CopySent Aggregation::sendToAggregator(std::string_view copy, const std::string& session) {
   const Lock held(_mutex);
   if (!active()) return {};
-  return {true, queue(copy)};
+  if (const auto failure = _connection->sendEvent(copy)) return {true, lineOf(*failure)};
+  return {true, std::nullopt, session};
 }
 
 std::optional<std::string> Aggregation::shutdownSessionAggregation(std::uint32_t sessionID) {
@@ -29,8 +30,11 @@ std::optional<std::string> Aggregation::shutdownSessionAggregation(std::uint32_t
 
 std::optional<std::string> Aggregation::queue(std::string_view frame) {
   const auto failure = _connection->sendEvent(frame);
-  if (!failure) return std::nullopt;
-  return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + *failure);
+  return failure ? lineOf(*failure) : std::nullopt;
+}
+
+std::optional<std::string> Aggregation::lineOf(const std::string& failure) {
+  return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + failure);
 }
 
 std::optional<std::string> Aggregation::end() {

@@ -21,6 +21,8 @@ struct CopySent {
   bool taken = false;
   // Says that the copy was lost. Logged after all locks are released.
   std::optional<std::string> line;
+  // The session whose client gets it; empty: it was lost.
+  std::string to = {};
 };
 
 // Each session shares one with the families. Any thread. Copies and the end mark are queued under its lock,
@@ -32,7 +34,8 @@ class Aggregation {
   bool active() const { return _active.load(std::memory_order_relaxed); }
   void setActive(bool active);
   // Queues a frame of aggregatedCopy(). Does not block.
-  CopySent sendToAggregator(std::string_view copy);
+  // `session`: its ID.
+  CopySent sendToAggregator(std::string_view copy, const std::string& session);
   // Stops aggregating. If it was active, tells the client that no more copies follow.
   [[nodiscard]] std::optional<std::string> shutdownSessionAggregation(std::uint32_t sessionID);
   // Releases the connection.
@@ -40,6 +43,7 @@ class Aggregation {
 
  private:
   std::optional<std::string> queue(std::string_view frame) REQUIRES(_mutex);
+  std::optional<std::string> lineOf(const std::string& failure) REQUIRES(_mutex);
 
   // Written under the lock.
   std::atomic<bool> _active{false};

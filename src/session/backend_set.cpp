@@ -48,16 +48,24 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
 
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   auto made = std::make_shared<BackendSet>();
+  const auto notMade = [&making](const std::string& name, wire::Reason why) {
+    if (making.notMade) making.notMade->emplace_back(name, why);
+  };
   for (const auto& [name, profile] : storebag->backends) {
     if (!making.word.policy->makes(name)) {
       making.counters.count(wire::Reason::policy_backends);
+      notMade(name, wire::Reason::policy_backends);
       continue;
     }
     auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot);
-    if (!backend) continue;
+    if (!backend) {
+      notMade(name, backends::BackendFactory::whyNotMade(name));
+      continue;
+    }
     if (backend->hostsAreFixed() &&
         making.word.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
       making.counters.count(wire::Reason::policy_hosts);
+      notMade(name, wire::Reason::policy_hosts);
       backend->cleanup();
       continue;
     }

@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "backends/backend.h"
@@ -24,6 +25,9 @@ namespace veltrad::session {
 // By name. Back ends are called in the order of their names' bytes.
 using BackendSet = std::map<std::string, std::shared_ptr<backends::VeltraBackend>, std::less<>>;
 
+// Back ends of a section that were not made, and why.
+using NotMade = std::vector<std::pair<std::string, wire::Reason>>;
+
 struct BackendMaking {
   backends::BackendFactory& factory;
   support::DeviceIdentity& device;
@@ -33,6 +37,8 @@ struct BackendMaking {
   const config::OwnersWord& word;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
+  // Gets those that were not made, unless it is null.
+  NotMade* notMade = nullptr;
 };
 
 // Makes a back end for each entry of the section that the factory knows and the owner of the device allows;

@@ -35,4 +35,13 @@ backends::SharedDictionary keptInfo(Dictionary info,
   return {kept, &kept->info};
 }
 
+bool sameClient(const Dictionary& current, const Dictionary& updated) {
+  for (const char* key : {wire::kVeltraUserInfoClientName, wire::kVeltraUserInfoServiceName}) {
+    const std::string* before = current.string(key);
+    const std::string* now = updated.string(key);
+    if (!before || !now || *before != *now) return false;
+  }
+  return true;
+}
+
 }  // namespace veltrad::session

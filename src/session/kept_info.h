@@ -13,4 +13,7 @@ namespace veltrad::session {
 // user would keep too much, even without its batches. Called without a lock.
 backends::SharedDictionary keptInfo(Dictionary info, const std::shared_ptr<platform::MemoryAccount>& account);
 
+// Whether both name the same client and service. A name that is missing counts as a change.
+bool sameClient(const Dictionary& current, const Dictionary& updated);
+
 }  // namespace veltrad::session

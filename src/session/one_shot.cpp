@@ -10,12 +10,12 @@
 namespace veltrad::session {
 
 void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog& messageLog,
-                                const OneShotMessage& message) {
-  const Value* given =
-      message.sessionInfo ? message.sessionInfo->find(wire::kVeltraSessionInfoSessionID) : nullptr;
+                                OneShotMessage oneShot) {
+  const Dictionary* info = oneShot.facts.sessionInfo.get();
+  const Value* given = info ? info->find(wire::kVeltraSessionInfoSessionID) : nullptr;
   const std::int64_t number = given ? given->toInt64().value_or(0) : 0;
   logDebug("sendMessageWithSessionInfo: Sending single message with sessionID %ld", long{number});
-  if (!message.sessionInfo || !message.storebag) {
+  if (!info || !oneShot.storebag) {
     logError("RsendMessageWithSessionInfo: Attempted to send message with one or more nil parameters");
     return;
   }
@@ -23,24 +23,26 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   making.device.copyUniqueDeviceID(deviceID, sizeof deviceID);
   backends::SessionFacts facts;
   facts.device.udid = deviceID;
-  facts.take(message.userInfo);
-  const auto set = createBackends(making, message.storebag, message.sessionInfo, std::move(facts));
+  facts.take(oneShot.userInfo);
+  const auto set = createBackends(making, oneShot.storebag, info, std::move(facts));
   if (!set) {
     logError("sendMessageWithSessionInfo: No backends available to send single message");
     return;
   }
-  if (message.userInfo.given &&
-      !message.sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) {
+  if (oneShot.userInfo.given && !info->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false)) {
     logWarning("sendMessageWithSessionInfo: user info provided without requiring it.");
   }
-  const platform::TimeValue time = making.clock.now();
+  Message& message = oneShot.message;
+  message.time = making.clock.now();
+  oneShot.fates.describe(oneShot.facts, SessionFates::From::oneShot);
+  oneShot.fates.taken(message, SessionFates::From::oneShot, oneShot.edits,
+                      set->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt);
   for (const auto& [name, backend] : *set) backend->updateState();
   forbidByWord(*set, making.word);
   for (const auto& [name, backend] : *set) {
     const auto [decision, answer] =
-        backend->sendMessage(message.payload ? std::optional(*message.payload) : std::nullopt, time,
-                             message.category, message.type, 0, message.note);
-    if (message.outcomes) message.outcomes->push_back({name, decision});
+        backend->sendMessage(message.payload, message.time, message.category, message.type, 0, message.note);
+    if (oneShot.outcomes) oneShot.outcomes->push_back({name, decision});
     if (answer) messageLog.writeToLogFile("[%@ -> sendMessageWithSessionInfo] %@", name, *answer);
   }
   for (const auto& [name, backend] : *set) backend->cleanup();

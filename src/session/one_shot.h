@@ -5,19 +5,22 @@
 #include <cstdint>
 
 #include "session/backend_set.h"
+#include "session/routing.h"
+#include "session/session_delegate.h"
+#include "session/session_fates.h"
 #include "support/message_log.h"
 
 namespace veltrad::session {
 
-// Pointers may be null.
 struct OneShotMessage {
-  const Dictionary* sessionInfo = nullptr;
+  // Of the session that took it in, with the message's session info.
+  FamilyFacts facts;
+  SessionFates& fates;
   backends::UserInfo userInfo;
   const config::StorebagSection* storebag = nullptr;
-  std::uint16_t category = 0;
-  std::uint16_t type = 0;
-  const Dictionary* payload = nullptr;
-  backends::MessageNote note = {};
+  Message message;
+  // What the owner keeps back of the payload.
+  const config::EditedFields* edits = nullptr;
   // Gets what became of the message, unless it is null because nobody waits for it.
   wire::Outcomes* outcomes = nullptr;
 };
@@ -25,6 +28,6 @@ struct OneShotMessage {
 // Makes the back ends that the storebag names, updates their states, sends the message with flag 0 through
 // each, logs their answers and cleans them up. Work that is still under way does not need the message.
 void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog& messageLog,
-                                const OneShotMessage& message);
+                                OneShotMessage oneShot);
 
 }  // namespace veltrad::session

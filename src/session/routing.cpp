@@ -5,9 +5,24 @@
 #include "base/text.h"
 #include "platform/log.h"
 #include "session/flush_counters.h"
+#include "session/session_delegate.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {
+
+CopySent sendCopy(const CopySender& sender, std::int32_t hierarchy, const Message& message) {
+  const FamilyPlace place{sender.aggregation, sender.userInfo.given, hierarchy};
+  // A root has no ancestors, so it does not need the families' lock.
+  const bool toAncestor = hierarchy > 0 && sender.delegate.ancestorAggregates(place);
+  if (!toAncestor && !sender.aggregation.active()) return {};
+  const std::string copy =
+      aggregatedCopy(sender.sessionInfo, sender.userInfo.sent, platform::timevalToSeconds(message.time),
+                     message.category, message.type, message.payload ? &*message.payload : nullptr);
+  CopySent sent;
+  if (toAncestor) sent = sender.delegate.sendToAncestor(place, copy);
+  if (!sent.taken) sent = sender.aggregation.sendToAggregator(copy, sender.sessionIDString);
+  return sent;
+}
 
 std::optional<std::string> offerToBackends(const BackendSet& backends, Message message,
                                            support::MessageLog& messageLog, wire::Outcomes* outcomes) {
@@ -55,10 +70,11 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
 }
 
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
-                support::MessageLog& messageLog) {
+                const backends::MessageNote& note, support::MessageLog& messageLog) {
   bool uploaded = false;
   if (backends) {
-    for (const auto& [name, backend] : *backends) uploaded |= backend->uploadFileAtPath(path, extensionToken);
+    for (const auto& [name, backend] : *backends)
+      uploaded |= backend->uploadFileAtPath(path, extensionToken, note);
   }
   if (uploaded) {
     logDebug("uploadFileWithURL: File upload successful for %s", path.c_str());

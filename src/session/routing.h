@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 
+#include "session/aggregation.h"
 #include "session/backend_set.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
@@ -13,6 +14,7 @@
 namespace veltrad::session {
 
 class FlushCounters;
+class VeltradSessionDelegate;
 
 struct Message {
   std::optional<Dictionary> payload;
@@ -22,6 +24,18 @@ struct Message {
   std::int32_t flag = 0;
   backends::MessageNote note = {};
 };
+
+// Who sends a copy.
+struct CopySender {
+  VeltradSessionDelegate& delegate;
+  Aggregation& aggregation;
+  const std::string& sessionIDString;
+  const backends::SharedDictionary& sessionInfo;
+  const backends::UserInfo& userInfo;
+};
+// Sends a copy of the message to the client that aggregates, if there is one: that of the topmost ancestor,
+// else the session's own.
+CopySent sendCopy(const CopySender& sender, std::int32_t hierarchy, const Message& message);
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.
 // Adds what became of it to `outcomes`, unless that is null because nobody waits for it.
@@ -34,7 +48,7 @@ void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::
 
 // These return whether a back end uploaded the data. `backends` may be null.
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,
-                support::MessageLog& messageLog);
+                const backends::MessageNote& note, support::MessageLog& messageLog);
 bool uploadLogDataArray(const BackendSet* backends, const Array& logData, const backends::MessageNote& note);
 
 }  // namespace veltrad::session

@@ -18,13 +18,6 @@
 namespace veltrad::session {
 
 namespace {
-// A name that is missing counts as a change.
-bool sameName(const Dictionary& current, const Dictionary& updated, const char* key) {
-  const std::string* before = current.string(key);
-  const std::string* now = updated.string(key);
-  return before && now && *before == *now;
-}
-
 std::string newSessionIDString() {
   const auto uuid = platform::randomUUID();
   return encodeBase64({reinterpret_cast<const char*>(uuid.data()), uuid.size()});
@@ -49,7 +42,8 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
       _sessionIDString(std::move(sessionIDString)),
       _account(connection->memoryAccount()),
       _aggregation(std::make_shared<Aggregation>(std::move(connection))),
-      _word(services.gate) {
+      _word(services.gate),
+      _fates(services.fates) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
 
@@ -94,10 +88,12 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
 void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
   _saidWithoutUserInfo = false;
   _userInfo = _word.allowed(std::move(info));
+  _fates.forget();
 }
 
 void VeltradSession::hearOwner() {
   while (_word.hear()) {
+    _fates.forget();
     _word.takeIdentity(_services.device, _deviceid, _backends.get());
     _userInfo = _word.allowed(_userInfo.given);
     if (!_backends) continue;
@@ -133,9 +129,10 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   facts.device.udid = _deviceid;
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
-  auto made = createBackends({_services.factory, _services.device, _services.library, _services.clock,
-                              _services.counters, _word.now(), _account},
-                             &storebag, _sessionInfo.get(), std::move(facts));
+  auto made = createBackends(
+      {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
+       _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo)},
+      &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   // Clean up the back ends that a second start has replaced.
   if (made) {
@@ -174,9 +171,7 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
     if (_sessionInfo && _sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false))
       return;
   }
-  const bool unchanged = current && updated &&
-                         sameName(*current, *updated, wire::kVeltraUserInfoClientName) &&
-                         sameName(*current, *updated, wire::kVeltraUserInfoServiceName);
+  const bool unchanged = current && updated && sameClient(*current, *updated);
   keepUserInfo(std::move(updated));
   if (_backends) {
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
@@ -215,47 +210,67 @@ void VeltradSession::finishSessionWithReply(wire::StringReply reply) {
 std::optional<std::string> VeltradSession::sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                                    wire::OptionalDictionary payload,
                                                                    wire::Outcomes* outcomes, Origin origin) {
-  if (!hasBackends(origin)) return std::nullopt;
-  return sendMessage({std::move(payload), {}, category, type, 0}, outcomes);
+  Message message{std::move(payload), {}, category, type, 0};
+  if (!hasBackends(message, origin)) return std::nullopt;
+  return sendMessage(std::move(message), outcomes, origin);
 }
 
-std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary message,
+std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary given,
                                                                      wire::Outcomes* outcomes) {
-  if (!hasBackends(Origin::client)) return std::nullopt;
-  const auto category = message.uint16(wire::kVeltraMessageParametersCategory);
+  const auto category = given.uint16(wire::kVeltraMessageParametersCategory);
+  const auto type = given.uint16(wire::kVeltraMessageParametersType);
+  Message message{given.takeDictionary(wire::kVeltraMessageParametersPayload),
+                  {},
+                  category.value_or(0),
+                  type.value_or(0),
+                  given.int32(wire::kVeltraMessageParametersFlag).value_or(0)};
+  if (!hasBackends(message, Origin::client)) return std::nullopt;
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
-    _services.counters.count(wire::Reason::no_category);
-    return std::nullopt;
+    return refused(std::move(message), wire::Reason::no_category);
   }
-  const auto type = message.uint16(wire::kVeltraMessageParametersType);
   if (!type) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'type'");
-    _services.counters.count(wire::Reason::no_type);
-    return std::nullopt;
+    return refused(std::move(message), wire::Reason::no_type);
   }
-  const std::int32_t flag = message.int32(wire::kVeltraMessageParametersFlag).value_or(0);
-  auto payload = message.takeDictionary(wire::kVeltraMessageParametersPayload);
-  return sendMessage({std::move(payload), {}, *category, *type, flag}, outcomes);
+  return sendMessage(std::move(message), outcomes, Origin::client);
 }
 
-bool VeltradSession::hasBackends(Origin origin) {
+bool VeltradSession::hasBackends(Message& message, Origin origin) {
   hearOwner();
   if (_backends) return true;
   logDebug("sendMessageWithDictionary: No backends available to send message");
-  if (origin == Origin::client) _services.counters.count(wire::Reason::no_backends);
+  if (origin == Origin::client) static_cast<void>(refused(std::move(message), wire::Reason::no_backends));
   return false;
 }
 
+std::nullopt_t VeltradSession::refused(Message message, wire::Reason why) {
+  _services.counters.count(why);
+  _fates.refused(familyFacts(), std::move(message), Origin::client, why);
+  return std::nullopt;
+}
+
+SessionFates& VeltradSession::fates() {
+  if (!_fates.described()) _fates.describe(familyFacts(), Origin::client);
+  return _fates;
+}
+
 // Sets the message's time. There are back ends.
-std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Outcomes* outcomes) {
+std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Outcomes* outcomes,
+                                                       Origin origin) {
   const config::EditedFields edits = _word.restrict(message.payload);
-  message.note = {&edits};
   message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
+  fates().taken(message, origin, &edits,
+                _backends->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt);
   sayWithoutUserInfo();
   const std::int32_t hierarchy = hierarchyOf(_backends.get());
-  if (hierarchy > 0 || _aggregation->active()) aggregateMessage(hierarchy, message);
+  if (hierarchy > 0 || _aggregation->active()) {
+    const CopySent sent = sendCopy(
+        {_sessionDelegate, *_aggregation, _sessionIDString, _sessionInfo, _userInfo}, hierarchy, message);
+    if (sent.line) logError("%s", sent.line->c_str());
+    if (!sent.to.empty()) _fates.aggregated(message, sent.to);
+  }
   return offerToBackends(*_backends, std::move(message), _services.messageLog, outcomes);
 }
 
@@ -273,20 +288,6 @@ void VeltradSession::sayWithoutUserInfo() {
   logInfo("getAncestorWithAggregatorForSession: No user info found for session %u", _sessionID);
 }
 
-void VeltradSession::aggregateMessage(std::int32_t hierarchy, const Message& message) {
-  const FamilyPlace place{*_aggregation, _userInfo.given, hierarchy};
-  // A root has no ancestors, so it does not need the families' lock.
-  const bool toAncestor = hierarchy > 0 && _sessionDelegate.ancestorAggregates(place);
-  if (!toAncestor && !_aggregation->active()) return;
-  const std::string copy =
-      aggregatedCopy(_sessionInfo, _userInfo.sent, platform::timevalToSeconds(message.time), message.category,
-                     message.type, message.payload ? &*message.payload : nullptr);
-  CopySent sent;
-  if (toAncestor) sent = _sessionDelegate.sendToAncestor(place, copy);
-  if (!sent.taken) sent = _aggregation->sendToAggregator(copy);
-  if (sent.line) logError("%s", sent.line->c_str());
-}
-
 void VeltradSession::flushMessagesWithCompletion(wire::FlushReply completion) {
   logDebug("flushMessagesWithCompletion: Flushing messages for session %u", _sessionID);
   hearOwner();
@@ -297,14 +298,17 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
                                       wire::BooleanReply completionHandler) {
   logDebug("uploadFileAtPath: Uploading file for session %u", _sessionID);
   hearOwner();
-  const bool uploaded = uploadFile(_backends.get(), path, extensionToken, _services.messageLog);
+  const bool uploaded = uploadFile(_backends.get(), path, extensionToken,
+                                   fates().taken(SessionFates::Item::file), _services.messageLog);
   if (completionHandler) completionHandler(uploaded);
 }
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   hearOwner();
   const config::EditedFields edits = _word.restrict(logData);
-  const bool uploaded = uploadLogDataArray(_backends.get(), logData, {&edits});
+  backends::MessageNote note = fates().taken(SessionFates::Item::logData);
+  note.edits = &edits;
+  const bool uploaded = uploadLogDataArray(_backends.get(), logData, note);
   if (completionHandler) completionHandler(uploaded, std::nullopt);
 }
 
@@ -312,43 +316,41 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
                                                 wire::OptionalDictionary userInfo, std::uint16_t category,
                                                 std::uint16_t type, wire::OptionalDictionary payload,
                                                 wire::SentReply reply) {
+  SessionFates fates(_services.fates);
+  Message message{std::move(payload), {}, category, type, 0};
+  const auto refuse = [&](wire::Reason why) {
+    _services.counters.count(why);
+    fates.refused(familyFacts(), std::move(message), Origin::oneShot, why);
+  };
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
     logError("sendMessageWithSessionInfo: Could not retrieve identifiers from sessionInfo");
-    _services.counters.count(wire::Reason::no_identifiers);
-    return;  // without a reply, which ends the client's call
+    return refuse(wire::Reason::no_identifiers);  // without a reply, which ends the client's call
   }
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
   backends::SharedDictionary kept;
   backends::SharedDictionary identity;
   if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
-    _services.counters.count(wire::Reason::message_over_share);
-    return;
+    return refuse(wire::Reason::message_over_share);
   }
   _sessionInfo = kept;
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
   const auto storebag = _sessionDelegate.storebagForSession(*this);
   if (!storebag) {
-    _services.counters.count(wire::Reason::no_storebag);
+    refuse(wire::Reason::no_storebag);
     if (reply) reply("storebag not available", {});
     return;
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
   hearOwner();
-  const config::EditedFields edits = _word.restrict(payload);
+  const config::EditedFields edits = _word.restrict(message.payload);
   wire::Outcomes outcomes;
   veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, true},
+       _word.now(), _account, true, fates.comesFrom(storebag->origin, kept)},
       _services.messageLog,
-      {kept.get(),
-       _word.allowed(identity),
-       storebag.get(),
-       category,
-       type,
-       payload ? &*payload : nullptr,
-       {&edits},
+      {familyFacts(), fates, _word.allowed(identity), storebag.get(), std::move(message), &edits,
        reply ? &outcomes : nullptr});
   if (reply) reply("finished", std::move(outcomes));
 }

@@ -19,6 +19,7 @@
 #include "platform/preferences.h"
 #include "session/backend_set.h"
 #include "session/heard_word.h"
+#include "session/session_fates.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
 
@@ -42,6 +43,8 @@ struct SessionServices {
   FlushCounters& flushes;
   support::MessageLog& messageLog;
   const config::OwnerGate& gate;
+  // Null: what becomes of messages is not recorded.
+  platform::FateRing* fates = nullptr;
 };
 
 // The agent's list and the connection own it. The delegate outlives it.
@@ -91,21 +94,24 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // Charges the dictionary to the user. False, and counted, if it is too much.
   bool charged(wire::OptionalDictionary given, backends::SharedDictionary& kept);
   void keepUserInfo(backends::SharedDictionary info);
-  // Messages of the session itself are not counted as lost.
-  enum class Origin { client, session };
+  // Whose message it is; those of the session itself are not counted as lost.
+  using Origin = SessionFates::From;
   // Hears the owner's word first.
-  bool hasBackends(Origin origin);
+  bool hasBackends(Message& message, Origin origin);
   // These check the message and return the answer for the client. `outcomes` is null if nobody waits for
   // them.
   std::optional<std::string> sendMessageWithCategory(std::uint16_t category, std::uint16_t type,
                                                      wire::OptionalDictionary payload,
                                                      wire::Outcomes* outcomes,
                                                      Origin origin = Origin::client);
-  std::optional<std::string> sendMessageWithDictionary(Dictionary message, wire::Outcomes* outcomes);
+  std::optional<std::string> sendMessageWithDictionary(Dictionary given, wire::Outcomes* outcomes);
   // Passes the message to the aggregating client and every back end.
-  std::optional<std::string> sendMessage(Message message, wire::Outcomes* outcomes);
+  std::optional<std::string> sendMessage(Message message, wire::Outcomes* outcomes, Origin origin);
+  // The record of fates, which knows what the session is.
+  SessionFates& fates();
+  // Counts and records why the client's message reaches no back end. Returns nothing.
+  std::nullopt_t refused(Message message, wire::Reason why);
   void sayWithoutUserInfo();
-  void aggregateMessage(std::int32_t hierarchy, const Message& message);
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
 
   FamilyFacts familyFacts() const;
@@ -126,6 +132,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   backends::SharedDictionary _sessionInfo;
   backends::UserInfo _userInfo;
   HeardWord _word;
+  SessionFates _fates;
   // It must not join its family again.
   bool _leftFamily = false;
   std::shared_ptr<const BackendSet> _backends;

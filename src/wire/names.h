@@ -25,6 +25,7 @@ inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:"
 namespace question {
 inline constexpr const char* kConfig = "config";
 inline constexpr const char* kDoctor = "doctor";
+inline constexpr const char* kFates = "fates";
 inline constexpr const char* kHistory = "history";
 inline constexpr const char* kHistoryBody = "historyBody";
 inline constexpr const char* kMetrics = "metrics";

@@ -58,12 +58,13 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   bounds.userKept = 3 * size.charged;
   platform::MemoryBudget budget(bounds);
   const auto account = budget.accountOf(1);
-  const auto held = std::make_shared<backends::HeldEvents>(counters);
+  const auto held = std::make_shared<backends::HeldEvents>(counters, platform::FatePen());
   account->add(held);
   const auto add = [&](int number, std::uint64_t built) {
     auto charge = account->keep(size.charged);
     ASSERT_TRUE(charge);
-    held->add(5, {event(number), size, account->nextTurn()}, std::move(*charge), built);
+    held->add(5, {event(number), size, account->nextTurn()}, std::move(*charge), built, wire::Step::batched,
+              {});
   };
   const auto built = held->sessionIDChanges();
   for (int number : {1, 2, 3, 4}) add(number, built);  // the first makes room for the fourth
@@ -88,9 +89,10 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   EXPECT_EQ(held->needOf(5, 1, size), backends::HeldEvents::Need::room);
   EXPECT_EQ(held->needOf(5, 1, {backends::EventBatch::kMostBytes, 0}), backends::HeldEvents::Need::bound);
   held->add(5, {event(7), {backends::EventBatch::kMostBytes, size.charged}, 9}, *account->keep(size.charged),
-            2);
+            2, wire::Step::batched, {});
   EXPECT_EQ(counters.value(wire::Reason::batch_full), 1u);
-  EXPECT_EQ(held->discard(), 1u);
+  held->discard(wire::Reason::refused_by_owner);
+  EXPECT_EQ(counters.value(wire::Reason::refused_by_owner), 1u);
   EXPECT_EQ(account->used(), 0u);
 }
 

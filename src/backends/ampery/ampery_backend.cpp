@@ -25,22 +25,22 @@ AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters,
 Sent AmperyBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, *forbidden});
   }
   if (message.method == 0 || !message.payload || message.payload->empty()) {
     const wire::Reason why =
         message.method == 0 ? wire::Reason::energy_category_zero : wire::Reason::energy_payload_empty;
     _counters.count(why);
-    return {{wire::Fate::none, why}, std::nullopt};
+    return settled(message, {wire::Fate::none, why});
   }
   Dictionary event = *std::move(message.payload);
   event.merge({{"event", unsigned{message.eventID}},
                {"method", unsigned{message.method}},
                {"respCode", unsigned{message.respCode}}});
   if (!_energyLog.logRegisteredEvent(kEnergyLogClient, kEnergyLogEvent, event)) {
-    return {{wire::Fate::dropped, wire::Reason::energy_log_failed}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, wire::Reason::energy_log_failed});
   }
-  return {{wire::Fate::written, wire::Reason::always}, std::nullopt};
+  return settled(message, {wire::Fate::written, wire::Reason::always});
 }
 
 }  // namespace veltrad::backends

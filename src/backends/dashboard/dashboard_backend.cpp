@@ -93,7 +93,13 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
   }
   const std::string host = server.host();
   const std::string to = "udp://" + host + ":" + std::to_string(ntohs(server.address->sin_port));
-  const NetworkProcQueue::Kind kind{reliable, making.oneShot, server.period, host, to, making.gate};
+  const NetworkProcQueue::Kind kind{reliable,
+                                    making.oneShot,
+                                    server.period,
+                                    host,
+                                    to,
+                                    making.gate,
+                                    {making.fates, wire::kVeltraBackendDashboard}};
   auto queue = std::make_shared<NetworkProcQueue>(std::move(socket), std::move(timer), kind, making.account,
                                                   making.queues, making.counters);
   if (reliable && !queue->startReading(pool)) {
@@ -175,7 +181,7 @@ DashboardBackend::~DashboardBackend() {
 Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, *forbidden});
   }
   tagReportingPacket packet;
   packet.header = headerOf(message);
@@ -187,7 +193,11 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
 
   std::string line = writeLocalLog(packet);
   const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
-  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note)), std::move(line)};
+  wire::StepEntry fate = stepOf(message);
+  fate.text = pen().textOf(_networkProcQueue->address());
+  fate.bytes = static_cast<std::uint32_t>(length);
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note), fate),
+          std::move(line)};
 }
 
 tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
@@ -213,15 +223,32 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
 }
 
 bool DashboardBackend::uploadLogData(const Array& logData, const MessageNote& note) {
+  wire::StepEntry fate;
+  fate.message = note.number;
   if (prohibition()) {
     _counters.count(wire::Reason::log_data_refused_by_owner);
+    pen().write(wire::Step::dropped, wire::Reason::log_data_refused_by_owner, fate);
     return false;
   }
-  const auto location = _uploads.upload(_postURL, logData, owner(note));
+  const auto location = _uploads.upload(_postURL, logData, owner(note), pen(), fate);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
-  sendMessage(payload, _clock.now(), 0, 2, 0);
+  const platform::TimeValue now = _clock.now();
+  sendMessage(payload, now, 0, 2, 0, notedMessage(now, note.session));
   return true;
+}
+
+// The message is of this back end alone.
+MessageNote DashboardBackend::notedMessage(platform::TimeValue now, wire::FateRef session) const {
+  if (!pen().writes()) return {};
+  wire::MessageEntry entry;
+  entry.from = wire::MessageEntry::From::session;
+  entry.session = session;
+  entry.message = pen().ring()->nextMessage();
+  entry.time = platform::FateRing::microseconds(now);
+  entry.type = 2;
+  pen().ring()->write(entry);
+  return {nullptr, entry.message, session};
 }
 
 void DashboardBackend::cleanup() {

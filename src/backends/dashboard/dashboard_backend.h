@@ -30,6 +30,7 @@ struct DashboardMaking {
   std::shared_ptr<platform::MemoryAccount> account;
   bool oneShot = false;
   config::OwnerGate* gate = nullptr;
+  platform::FateRing* fates = nullptr;
 };
 
 // The initialisers return null, after one error line, if the back end cannot work.
@@ -69,6 +70,7 @@ class DashboardBackend final : public VeltraBackend {
                    const config::DashboardProfile* profile, const std::string& productFamily);
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
+  MessageNote notedMessage(platform::TimeValue now, wire::FateRef session) const;
   DatagramOwner owner(const MessageNote& note) const;
 
   LogDataUploads& _uploads;

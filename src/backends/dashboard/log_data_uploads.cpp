@@ -25,33 +25,49 @@ std::optional<std::string> archiveOf(const Array& logData) {
 }  // namespace
 
 std::optional<std::string> LogDataUploads::upload(const std::optional<std::string>& postURL,
-                                                  const Array& logData, const DatagramOwner& owner) {
+                                                  const Array& logData, const DatagramOwner& owner,
+                                                  const platform::FatePen& pen, wire::StepEntry fate) {
+  const auto refused = [&](wire::Reason why) {
+    _counters.count(why);
+    pen.write(wire::Step::dropped, why, fate);
+    return std::nullopt;
+  };
   if (!postURL) {
     logError("DashboardBackend(uploadLogData): Post URL for log data array is nil");
-    _counters.count(wire::Reason::log_data_no_address);
-    return std::nullopt;
+    return refused(wire::Reason::log_data_no_address);
   }
   auto archive = archiveOf(logData);
   if (!archive) {
     logError("DashboardBackend(uploadLogData): Failed to serialize log data array for upload");
-    _counters.count(wire::Reason::log_data_no_memory);
-    return std::nullopt;
+    return refused(wire::Reason::log_data_no_memory);
   }
-  const auto body = post(*postURL, std::move(*archive), owner);
-  if (!body.ok() || body.value().empty()) {
+  fate.post = pen.newNumber();
+  fate.text = pen.textOf(*postURL);
+  fate.bytes = static_cast<std::uint32_t>(archive->size());
+  fate.events = 1;
+  pen.write(wire::Step::posted, std::nullopt, fate);
+  const http::HTTPResult answer = post(*postURL, std::move(*archive), owner);
+  const bool located = answer && !answer.value().body.empty();
+  const wire::Reason end = located  ? wire::Reason::log_data_uploaded
+                           : answer ? wire::Reason::log_data_no_place
+                                    : wire::Reason::log_data_failed;
+  _counters.count(end);
+  if (answer) fate.status = static_cast<std::uint16_t>(answer.value().status);
+  const wire::Step failure =
+      !answer && !answer.error().mayHaveArrived() ? wire::Step::dropped : wire::Step::lost;
+  pen.write(answer ? wire::Step::answered : failure, end, fate);
+  if (!located) {
     logError("DashboardBackend(uploadLogData): Error uploading log data array (%s)",
-             body.ok() ? "" : body.error().c_str());
-    _counters.count(body.ok() ? wire::Reason::log_data_no_place : wire::Reason::log_data_failed);
+             answer ? "" : answer.error().description.c_str());
     return std::nullopt;
   }
-  _counters.count(wire::Reason::log_data_uploaded);
-  std::string location = toUTF8(body.value());
+  std::string location = toUTF8(answer.value().body);
   logDebug("DashboardBackend(uploadLogData): Log data uploaded to %s", location.c_str());
   return location;
 }
 
-Result<std::string, std::string> LogDataUploads::post(const std::string& url, std::string archive,
-                                                      const DatagramOwner& owner) {
+http::HTTPResult LogDataUploads::post(const std::string& url, std::string archive,
+                                      const DatagramOwner& owner) {
   http::HTTPRequest request;
   request.method = http::HTTPRequest::Method::post;
   request.lane = http::HTTPRequest::Lane::logData;
@@ -61,9 +77,7 @@ Result<std::string, std::string> LogDataUploads::post(const std::string& url, st
   request.client = owner.client;
   request.about = owner.about;
   request.mostResponseBytes = kMostLogAnswerBytes;
-  http::HTTPResult result = _http.perform(std::move(request));
-  if (!result.ok()) return Failure{result.error().description};
-  return std::move(result.value().body);
+  return _http.perform(std::move(request));
 }
 
 }  // namespace veltrad::backends

@@ -6,10 +6,10 @@
 #include <string>
 
 #include "backends/dashboard/udp_packet_to_send.h"
-#include "base/result.h"
 #include "base/value.h"
 #include "http/http_client.h"
 #include "platform/counters.h"
+#include "platform/fate_pen.h"
 
 namespace veltrad::backends {
 
@@ -21,13 +21,13 @@ class LogDataUploads {
 
   // Returns the location in the server's answer, whatever its status. Nothing, after one error line, if there
   // is no answer or it is empty.
+  // What becomes of it is also written with the pen; `fate` says of which upload.
   std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData,
-                                    const DatagramOwner& owner = {});
+                                    const DatagramOwner& owner, const platform::FatePen& pen,
+                                    wire::StepEntry fate);
 
  private:
-  // Returns the answer's body, or why there is none.
-  Result<std::string, std::string> post(const std::string& url, std::string archive,
-                                        const DatagramOwner& owner);
+  http::HTTPResult post(const std::string& url, std::string archive, const DatagramOwner& owner);
 
   http::HTTPClient& _http;
   platform::Counters& _counters;

@@ -18,33 +18,37 @@ constexpr const char* kNoMemory = "no memory to await its acknowledgement";
 constexpr std::size_t kMostCopies = MessageQueue::maxPendingSharedPackets * 2 * (kMostRetransmits + 1);
 }  // namespace
 
-MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder recorder)
+MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder recorder, Tell tell)
     : _reliableUDP(reliableUDP),
       _most(shared ? maxPendingSharedPackets : maxPendingPackets),
       _send(std::move(send)),
-      _recorder(std::move(recorder)) {
+      _recorder(std::move(recorder)),
+      _tell(std::move(tell)) {
   if (shared) _copies.emplace(kMostCopies);
 }
 
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                                                std::optional<platform::Charge> charge,
-                                               const DatagramOwner& owner) {
+                                               const DatagramOwner& owner, std::uint64_t message) {
   const bool sent = _send(datagram);
   const std::uint64_t record = sent ? recordSent(datagram, owner) : 0;
-  First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt};
+  First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt, 0, false};
   const bool waits = !sent || _reliableUDP;
   if (sent && _recorder.ended && (!waits || !charge))
     _recorder.ended(record, datagram.size(), 1, waits ? kNoMemory : "");
   if (!waits) return result;
   if (!charge)
-    return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt};
+    return {sent ? wire::Reason::no_memory_to_await : wire::Reason::no_memory_to_hold, std::nullopt, 0,
+            false};
   const auto state = sent ? UDPPacketToSend::awaitsAcknowledgement : UDPPacketToSend::notSent;
-  _pending.push_back({std::string(datagram), eventNumber, ++_lastSerial, std::move(*charge), state});
+  _pending.push_back({std::string(datagram), eventNumber, ++_lastSerial, std::move(*charge), message, state});
   _pending.back().owner = owner;
   _pending.back().record = record;
   if (sent && _copies) _copies->sent(_lastSerial, eventNumber);
   if (_pending.size() > _most) {
     recordEnd(_pending.front(), kNotAcknowledged);
+    result.pushedOutMessage = _pending.front().message;
+    result.pushedOutSent = _pending.front().state == UDPPacketToSend::awaitsAcknowledgement;
     _pending.pop_front();
     result.pushedOut = _copies ? wire::Reason::shared_datagrams_wait : wire::Reason::datagrams_wait;
   }
@@ -70,6 +74,7 @@ bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (record.state == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
   if (!send(record)) return false;
   ++result.sent;
+  _tell(record.message, wire::Step::sent, wire::Reason::datagram_sent);
   record.state = UDPPacketToSend::awaitsAcknowledgement;
   record.record = recordSent(record.data, record.owner);
   if (!_reliableUDP) recordEnd(record, "");
@@ -79,6 +84,7 @@ bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
 bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   if (record.numberOfRetransmits >= kMostRetransmits) {
     ++result.givenUp;
+    _tell(record.message, wire::Step::given_up, wire::Reason::never_acknowledged);
     recordEnd(record, kNotAcknowledged);
     return true;
   }
@@ -89,6 +95,7 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
     record.numberOfChecks = 0;
     ++record.numberOfRetransmits;
     ++result.sentAgain;
+    _tell(record.message, wire::Step::again, wire::Reason::datagram_sent_again);
   }
   return false;
 }
@@ -122,6 +129,7 @@ bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
     return _copies ? answered == one.serial : one.eventNumber == eventNumber;
   });
   if (record == _pending.end()) return false;
+  _tell(record->message, wire::Step::acknowledged, wire::Reason::datagram_acknowledged);
   recordEnd(*record, "");
   _pending.erase(record);
   return true;

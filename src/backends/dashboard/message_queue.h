@@ -12,7 +12,7 @@
 #include "backends/dashboard/sent_copies.h"
 #include "backends/dashboard/udp_packet_to_send.h"
 #include "platform/memory_budget.h"
-#include "wire/reasons.h"
+#include "wire/fates.h"
 
 namespace veltrad::backends {
 
@@ -27,6 +27,9 @@ class MessageQueue {
   static constexpr std::size_t maxPendingSharedPackets = 1024;
   // Returns whether all bytes were sent.
   using Send = std::function<bool(std::string_view datagram)>;
+  // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
+  // or acknowledged.
+  using Tell = std::function<void(std::uint64_t message, wire::Step step, wire::Reason reason)>;
   // Told of each datagram that has been sent once, and once more when it has been sent for the last time.
   struct Recorder {
     std::function<std::uint64_t(std::string_view datagram, const DatagramOwner& owner)> sent;
@@ -39,6 +42,8 @@ class MessageQueue {
   struct First {
     wire::Reason fate;
     std::optional<wire::Reason> pushedOut;
+    std::uint64_t pushedOutMessage = 0;
+    bool pushedOutSent = false;
   };
   // How many datagrams were sent for the first time, sent again and given up.
   struct Tick {
@@ -48,11 +53,14 @@ class MessageQueue {
   };
 
   // `shared`: by one-shot messages, each of which has its own back end, which starts at event number 1.
-  MessageQueue(bool reliableUDP, bool shared, Send send, Recorder recorder = {});
+  MessageQueue(
+      bool reliableUDP, bool shared, Send send, Recorder recorder = {}, Tell tell = [](auto&&...) {});
 
-  // `charge` pays for the datagram while it waits. Without a charge it cannot wait.
+  // `charge` pays for the datagram while it waits. Without a charge it cannot wait. `message`: its number in
+  // the record of fates.
   First tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                     std::optional<platform::Charge> charge, const DatagramOwner& owner = {});
+                     std::optional<platform::Charge> charge, const DatagramOwner& owner = {},
+                     std::uint64_t message = 0);
   Tick tick();
   // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. False
   // if there is none.
@@ -63,6 +71,7 @@ class MessageQueue {
   bool reliableUDP() const { return _reliableUDP; }
   bool empty() const { return _pending.empty(); }
   std::size_t size() const { return _pending.size(); }
+  const std::list<UDPPacketToSend>& pending() const { return _pending; }
   // How many of the waiting datagrams were never sent.
   std::size_t notSent() const;
 
@@ -78,6 +87,7 @@ class MessageQueue {
   const std::size_t _most;
   const Send _send;
   const Recorder _recorder;
+  const Tell _tell;
   // Oldest first.
   std::list<UDPPacketToSend> _pending;
   std::uint64_t _lastSerial = 0;

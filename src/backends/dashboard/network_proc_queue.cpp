@@ -53,7 +53,10 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
             const bool room = !_kind.gate || _kind.gate->hasRoomForRecord();
             return room && mayLeave(0, datagram.size()) && _socket.send(datagram);
           },
-          recorder()),
+          recorder(),
+          [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
+            note(message, step, reason);
+          }),
       _schedule(now(), kind.period),
       _timer(std::move(timer)) {}
 
@@ -71,25 +74,51 @@ bool NetworkProcQueue::startReading(WorkPool& pool) {
 }
 
 wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                                              const DatagramOwner& owner) {
+                                              const DatagramOwner& owner, const wire::StepEntry& fate) {
   auto charge = chargeFor(datagram.size());
   const Lock held(_mutex);
   if (!_timer) {
     _counters.count(wire::Reason::ended_before_sent);
+    _kind.pen.write(wire::Step::dropped, wire::Reason::ended_before_sent, fate);
     return {wire::Fate::dropped, wire::Reason::ended_before_sent};
   }
   // Its bytes are counted with each transmission.
   if (!mayLeave(1, 0)) {
     _counters.count(wire::Reason::datagram_over_daily_limit);
+    _kind.pen.write(wire::Step::dropped, wire::Reason::datagram_over_daily_limit, fate);
     return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
   const MessageQueue::First first =
-      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner);
+      _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner, fate.message);
+  noteFirst(first, fate);
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
   if (!_armed) armTimer(now());
   return decisionOf(first.fate, _kind.reliableUDP);
+}
+
+void NetworkProcQueue::note(std::uint64_t message, wire::Step step, wire::Reason reason) const {
+  wire::StepEntry fate;
+  fate.message = message;
+  fate.status = step == wire::Step::sent && _kind.reliableUDP ? 1 : 0;
+  if (message != 0) _kind.pen.write(step, reason, fate);
+}
+
+// And of the one that it pushed out.
+void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEntry fate) const {
+  const wire::Decision decision = decisionOf(first.fate, _kind.reliableUDP);
+  const bool held = first.fate == wire::Reason::datagram_held;
+  const bool dropped = decision.fate == wire::Fate::dropped;
+  // Whether its acknowledgement is awaited.
+  fate.status = decision.fate == wire::Fate::waiting ? 1 : 0;
+  _kind.pen.write(dropped ? wire::Step::dropped
+                  : held  ? wire::Step::held
+                          : wire::Step::sent,
+                  first.fate, fate);
+  if (!first.pushedOut) return;
+  note(first.pushedOutMessage, first.pushedOutSent ? wire::Step::given_up : wire::Step::dropped,
+       *first.pushedOut);
 }
 
 bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
@@ -158,9 +187,18 @@ void NetworkProcQueue::end() {
 void NetworkProcQueue::dropWaiting() {
   const Lock held(_mutex);
   _counters.count(wire::Reason::datagram_refused_by_owner, _messageQueue.size());
+  noteEnd(wire::Reason::datagram_refused_by_owner, wire::Reason::datagram_refused_by_owner);
   _messageQueue.clear([this](const UDPPacketToSend& waiting) {
     if (_kind.gate) _kind.gate->receipt().add(http::Departure::Kind::datagram, waiting.owner.client, 1);
   });
+}
+
+// Of those that wait, which are given up.
+void NetworkProcQueue::noteEnd(wire::Reason ofSent, wire::Reason ofNotSent) const {
+  for (const UDPPacketToSend& one : _messageQueue.pending()) {
+    const bool sent = one.state == UDPPacketToSend::awaitsAcknowledgement;
+    note(one.message, sent ? wire::Step::given_up : wire::Step::dropped, sent ? ofSent : ofNotSent);
+  }
 }
 
 // `reason` applies to the datagrams that were sent.
@@ -168,6 +206,7 @@ void NetworkProcQueue::giveUp(wire::Reason reason) {
   const std::size_t notSent = _messageQueue.notSent();
   _counters.count(wire::Reason::ended_before_sent, notSent);
   _counters.count(reason, _messageQueue.size() - notSent);
+  noteEnd(reason, wire::Reason::ended_before_sent);
   _messageQueue.clear();
 }
 

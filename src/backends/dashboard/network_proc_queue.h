@@ -20,6 +20,7 @@
 #include "base/mutex.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
+#include "platform/fate_pen.h"
 #include "platform/memory_budget.h"
 #include "wire/fates.h"
 
@@ -46,6 +47,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::string address;  // "udp://IP:PORT"
     // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
     config::OwnerGate* gate = nullptr;
+    platform::FatePen pen = {};
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -57,8 +59,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // From now on acknowledgements are read. False if they cannot be.
   bool startReading(WorkPool& pool);
   // Called without a lock, because older data of the user may be dropped to make room.
+  // `fate`: what the record says of it.
   wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
-                              const DatagramOwner& owner = {});
+                              const DatagramOwner& owner = {}, const wire::StepEntry& fate = {});
   // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
   bool join();
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
@@ -69,6 +72,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // Gives up what waits.
   void dropWaiting();
   const std::string& host() const { return _kind.host; }
+  const std::string& address() const { return _kind.address; }
   bool reliableUDP() const { return _kind.reliableUDP; }
 
  private:
@@ -85,6 +89,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.
   bool chargeSocket() REQUIRES(_mutex);
+  void note(std::uint64_t message, wire::Step step, wire::Reason reason) const;
+  void noteFirst(const MessageQueue::First& first, wire::StepEntry fate) const;
+  void noteEnd(wire::Reason ofSent, wire::Reason ofNotSent) const REQUIRES(_mutex);
   void giveUp(wire::Reason reason) REQUIRES(_mutex);
 
   platform::Counters& _counters;

@@ -26,6 +26,8 @@ struct UDPPacketToSend {
   std::uint64_t serial;
   // Pays for the bytes.
   platform::Charge charge;
+  // Its number in the record of fates.
+  std::uint64_t message = 0;
   State state = notSent;
   // Ticks since the last transmission.
   int numberOfChecks = 0;

@@ -35,10 +35,12 @@ void EventBatch::add(std::int32_t method, Event event) {
   ++_counts[method];
 }
 
-void EventBatch::dropOldest() {
-  if (_events.empty()) return;
+std::uint64_t EventBatch::dropOldest() {
+  if (_events.empty()) return 0;
+  const std::uint64_t message = _events.front().message;
   unaccount(_events.front().size);
   _events.pop_front();
+  return message;
 }
 
 void EventBatch::setSessionID(const std::string& sessionID) {

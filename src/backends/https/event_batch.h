@@ -29,6 +29,8 @@ class EventBatch {
     std::uint64_t turn = 0;
     // See WrittenEvent; false once the user info or the filters have changed.
     bool settled = false;
+    // Its message's, in the record of fates.
+    std::uint64_t message = 0;
   };
 
   // The bounds of a batch, whatever the thresholds in the storebag are. Bytes are those of the JSON texts.
@@ -47,7 +49,8 @@ class EventBatch {
   // Whether the event would exceed a bound.
   bool full(const EventSize& event) const;
   void add(std::int32_t method, Event event);
-  void dropOldest();
+  // Returns the number of its message.
+  std::uint64_t dropOldest();
   // Called after a flush that a threshold caused, whatever its result.
   void restartCount(std::int32_t method) { _counts[method] = 0; }
 

@@ -60,6 +60,7 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
                                                         const std::optional<std::string>& url, Post post) {
   if (!url) {
     _counters.count(wire::Reason::post_url_nil, post.eventCount);
+    backEnd->pen().write(wire::Step::dropped, wire::Reason::post_url_nil, post.fate);
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
     return wire::Reason::post_url_nil;
   }
@@ -71,12 +72,14 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
   if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
-    return refusePost(*backEnd, post.eventCount, post.completion);
+    return refusePost(*backEnd, post.eventCount, post.completion, post.fate);
   }
   backEnd->postBegins();
-  const auto answered = [this, backEnd, postedTo = *url, eventCount = post.eventCount,
+  const std::uint64_t number = notePost(*backEnd, request, post.fate);
+  const auto answered = [this, backEnd, number, postedTo = *url, eventCount = post.eventCount,
                          completion = std::move(post.completion)](const http::HTTPResult& result) {
     backEnd->postEnded(result ? fmt::format("HTTP {}", result.value().status) : result.error().description);
+    noteEnd(*backEnd, result, number);
     auto error = handleAnswer(*backEnd, result, postedTo, eventCount);
     if (completion) completion(std::nullopt, std::move(error));
   };
@@ -87,14 +90,43 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
   return std::nullopt;
 }
 
+// Returns the post's number in the record.
+std::uint64_t EventPosts::notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
+                                   wire::StepEntry fate) {
+  const platform::FatePen& pen = backEnd.pen();
+  if (!pen.writes()) return 0;
+  fate.post = pen.newNumber();
+  fate.text = pen.textOf(request.url);
+  fate.bytes = static_cast<std::uint32_t>(request.body.size());
+  fate.events = static_cast<std::uint32_t>(request.events);
+  fate.time = 0;
+  pen.write(wire::Step::posted, std::nullopt, fate);
+  return fate.post;
+}
+
+void EventPosts::noteEnd(const VeltraBackend& backEnd, const http::HTTPResult& result, std::uint64_t post) {
+  wire::StepEntry fate;
+  fate.post = post;
+  const int status = result ? result.value().status : result.error().status;
+  const PostVerdict verdict = verdictOfStatus(status);
+  if (result || verdict.disablesBackend) {
+    fate.status = static_cast<std::uint16_t>(status);
+    return backEnd.pen().write(wire::Step::answered, verdict.reason, fate);
+  }
+  const http::HTTPError& error = result.error();
+  backEnd.pen().write(error.mayHaveArrived() ? wire::Step::lost : wire::Step::dropped, reasonOf(error), fate);
+}
+
 int EventPosts::compressionLevel() {
   const auto choices = _choices.current();
   return (choices ? *choices : config::OperatorChoices()).compression.level;
 }
 
 wire::Reason EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                                    const VeltraBackend::FlushCompletion& completion) {
+                                    const VeltraBackend::FlushCompletion& completion,
+                                    const wire::StepEntry& fate) {
   const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
+  backEnd.pen().write(wire::Step::dropped, wire::Reason::too_many_posts, fate);
   auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount);
   if (completion) completion(std::nullopt, std::move(error));
   return wire::Reason::too_many_posts;

@@ -37,6 +37,8 @@ class EventPosts {
     VeltraBackend::FlushCompletion completion;
     // As in http::Departure.
     Dictionary about = {};
+    // What the record of fates is to say of it: its message or batch.
+    wire::StepEntry fate = {};
   };
 
   // Removes and counts fields that JSON cannot represent.
@@ -50,13 +52,16 @@ class EventPosts {
                                               const std::optional<std::string>& url, Post post);
   // Counts the events as lost, under the reason that it returns, and calls `completion`, if there is one.
   wire::Reason refusePost(VeltraBackend& backEnd, std::size_t eventCount,
-                          const VeltraBackend::FlushCompletion& completion);
+                          const VeltraBackend::FlushCompletion& completion, const wire::StepEntry& fate);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
   // Frees what is kept from post to post.
   void rest() { _gzip.rest(); }
 
  private:
+  static std::uint64_t notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
+                                wire::StepEntry fate);
+  static void noteEnd(const VeltraBackend& backEnd, const http::HTTPResult& result, std::uint64_t post);
   int compressionLevel();
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
                                                    const std::string& url, std::size_t eventCount);

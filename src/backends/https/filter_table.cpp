@@ -30,6 +30,10 @@ FilterAction FilterTable::actionOn(std::string_view key, std::int32_t method, st
   return FilterAction::keep;
 }
 
+bool FilterTable::concerns(const std::string& name) const {
+  return _filters && !_filters->ofKey.empty() && _filters->ofKey.contains(lowerCase(name));
+}
+
 FilterTable::Outcome FilterTable::filterEvent(Dictionary& event, config::FieldChanges& changes) const {
   Outcome outcome;
   if (empty()) return outcome;

@@ -25,6 +25,8 @@ class FilterTable {
     std::size_t removed = 0;
     std::size_t hashed = 0;
   };
+  // Whether a filter names the field.
+  bool concerns(const std::string& name) const;
   // Filters the event in place by its own "_method" and "_status" (0 if missing). `changes` hears the names.
   Outcome filterEvent(Dictionary& event, config::FieldChanges& changes) const;
   // True if every field is kept.

@@ -5,8 +5,7 @@
 namespace veltrad::backends {
 
 HeldEvents::~HeldEvents() {
-  const Lock held(_mutex);
-  _counters.count(wire::Reason::ended_before_flush, _batch.size());
+  discard(wire::Reason::ended_before_flush);
 }
 
 std::size_t HeldEvents::size() const {
@@ -22,12 +21,12 @@ HeldEvents::Need HeldEvents::needOf(std::int32_t method, std::int32_t threshold,
 }
 
 void HeldEvents::add(std::int32_t method, EventBatch::Event event, platform::Charge charge,
-                     std::uint64_t sessionIDChanges) {
+                     std::uint64_t sessionIDChanges, wire::Step step, wire::StepEntry fate) {
   std::size_t dropped = 0;
   std::size_t overShare = 0;
   {
     const Lock held(_mutex);
-    for (; _batch.size() > 0 && _batch.full(event.size); ++dropped) _batch.dropOldest();
+    for (; _batch.size() > 0 && _batch.full(event.size); ++dropped) dropOldest(wire::Reason::batch_full);
     _charge.add(std::move(charge));
     const bool changed = sessionIDChanges != _sessionIDChanges.load(std::memory_order_relaxed);
     if (changed) {
@@ -35,6 +34,10 @@ void HeldEvents::add(std::int32_t method, EventBatch::Event event, platform::Cha
                   [this](Dictionary& fields) REQUIRES(_mutex) { fields.set("_sessionID", _sessionID); });
       event.size = sizeOfEvent(event.text);
     }
+    if (_batchNumber == 0) _batchNumber = _pen.newNumber();
+    fate.batch = _batchNumber;
+    _pen.write(step, std::nullopt, fate);
+    event.message = fate.message;
     _batch.add(method, std::move(event));
     if (dropped > 0 || changed) overShare = settle();
   }
@@ -66,15 +69,28 @@ void HeldEvents::unsettle() {
 
 HeldEvents::Taken HeldEvents::take() {
   const Lock held(_mutex);
-  return {_batch.take(), std::move(_charge)};
+  return {_batch.take(), std::move(_charge), std::exchange(_batchNumber, 0)};
 }
 
-std::size_t HeldEvents::discard() {
+std::size_t HeldEvents::discard(wire::Reason why) {
   const Lock held(_mutex);
   const std::size_t events = _batch.size();
+  _counters.count(why, events);
+  if (_batch.size() > 0) {
+    wire::StepEntry fate;
+    fate.batch = std::exchange(_batchNumber, 0);
+    _pen.write(wire::Step::dropped, why, fate);
+  }
   _batch.discard();
   _charge.release();
   return events;
+}
+
+void HeldEvents::dropOldest(wire::Reason why) {
+  wire::StepEntry fate;
+  fate.batch = _batchNumber;
+  fate.message = _batch.dropOldest();
+  _pen.write(wire::Step::dropped, why, fate);
 }
 
 std::optional<std::uint64_t> HeldEvents::oldestTurn() const {
@@ -86,7 +102,7 @@ void HeldEvents::dropOldest() {
   {
     const Lock held(_mutex);
     if (_batch.size() == 0) return;
-    _batch.dropOldest();
+    dropOldest(wire::Reason::event_over_share);
     settle();
   }
   _counters.count(wire::Reason::event_over_share);
@@ -96,7 +112,7 @@ void HeldEvents::dropOldest() {
 std::size_t HeldEvents::settle() {
   if (_charge.bytes() == 0) return 0;  // no account
   std::size_t dropped = 0;
-  for (; !_charge.resize(_batch.chargedBytes()); ++dropped) _batch.dropOldest();
+  for (; !_charge.resize(_batch.chargedBytes()); ++dropped) dropOldest(wire::Reason::event_over_share);
   return dropped;
 }
 

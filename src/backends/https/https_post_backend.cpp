@@ -7,6 +7,7 @@
 
 #include "backends/https/event_posts.h"
 #include "backends/https/json_fields.h"
+#include "config/noted_changes.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
@@ -52,7 +53,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
       _posts(making.posts),
       _gate(making.gate),
       _clientState(*this, profile, making.locale, making.counters, making.identity),
-      _held(std::make_shared<HeldEvents>(making.counters)) {
+      _held(std::make_shared<HeldEvents>(making.counters, making.pen)) {
   setDisplayURL(profile->displayURL);
 }
 
@@ -69,8 +70,7 @@ std::vector<std::string> HTTPSPostBackend::hosts() const {
 }
 
 void HTTPSPostBackend::dropWaiting() {
-  const std::size_t dropped = _held->discard();
-  _counters.count(wire::Reason::refused_by_owner, dropped);
+  const std::size_t dropped = _held->discard(wire::Reason::refused_by_owner);
   if (_gate) _gate->receipt().add(http::Departure::Kind::post, facts()->client, dropped);
 }
 
@@ -83,7 +83,7 @@ BackendActivity HTTPSPostBackend::activity() const {
 Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const StateVerdict verdict = stateVerdict(); verdict.state == kBackendDisabled) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, verdict.reason}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, verdict.reason});
   }
   _counters.eventTaken();
   // Read before the facts, so that a change between the two is noticed.
@@ -101,6 +101,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
     }
   }
   WrittenEvent event = writeEvent(*facts, message);
+  noteEdits(*facts, message, event.edits);
   addOwnersEdits(*facts, message.note, event.edits);
   if (meansSamplingOverride(message.flag) && state() == kBackendHeld) {
     setState({kBackendReporting, wire::Reason::reports});
@@ -112,7 +113,7 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
   const bool userInfoMissing = facts->requireUserInfo && !facts->userInfo;
   if (now == kBackendWaiting || now == kBackendHeld || (!realtime && batching) || userInfoMissing) {
     logDebug("HTTPSPostBackend(sendMessage): Batching %d, %d, %d", now, batching, facts->requireUserInfo);
-    return batchEvent(std::move(event), facts->account.get(), sessionIDChanges);
+    return batchEvent(std::move(event), message, facts->account.get(), sessionIDChanges);
   }
   return postEvent(std::move(event), *facts, message);
 }
@@ -167,8 +168,9 @@ Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
   std::optional<platform::Charge> charge{std::in_place};
   const EventSize size = sizeOfEvent(event.text);
   if (facts.account) charge = facts.account->tryCharge(size.charged, platform::MemoryUse::kept);
+  const wire::StepEntry fate = stepOf(message);
   if (!charge) {
-    return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr)}, std::move(flushed)};
+    return {{wire::Fate::dropped, _posts.refusePost(*this, 1, nullptr, fate)}, std::move(flushed)};
   }
   std::vector<std::string> events;
   events.push_back(std::move(event.text.json));
@@ -182,7 +184,7 @@ Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
   const auto refused =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
                              {std::move(posted.text), EventMap{message.method, message.respCode}, 1,
-                              std::move(*charge), 0, nullptr, about(facts, event.edits)});
+                              std::move(*charge), 0, nullptr, about(facts, event.edits), fate});
   if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
@@ -202,8 +204,8 @@ void HTTPSPostBackend::count(const FilterTable::Outcome& outcome) const {
   if (outcome.hashed > 0) _counters.count(wire::Reason::field_hashed, outcome.hashed);
 }
 
-Sent HTTPSPostBackend::batchEvent(WrittenEvent event, platform::MemoryAccount* account,
-                                  std::uint64_t sessionIDChanges) {
+Sent HTTPSPostBackend::batchEvent(WrittenEvent event, const NumberedMessage& message,
+                                  platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
   const std::int32_t method = event.method;
   std::optional<std::string> flushed;
   const EventSize size = sizeOfEvent(event.text);
@@ -222,29 +224,26 @@ Sent HTTPSPostBackend::batchEvent(WrittenEvent event, platform::MemoryAccount* a
     if (_held->empty()) _batchEdits = {};
     _batchEdits.add(event.edits);
   }
-  const wire::Reason kept =
-      keep(method, {std::move(event.text), size, account ? account->nextTurn() : 0, event.settled}, account,
-           sessionIDChanges);
-  _counters.count(kept);
-  if (kept != wire::Reason::event_batched) return {{wire::Fate::dropped, kept}, std::move(flushed)};
+  // Drops events of the user's other batches if necessary.
+  auto charge = account ? account->keep(size.charged) : platform::Charge();
   const StateVerdict verdict = stateVerdict();
   const bool reports = verdict.state == kBackendReporting;
-  return {{reports ? wire::Fate::batched : wire::Fate::held, verdict.reason}, std::move(flushed)};
-}
-
-// Drops events of the user's other batches if necessary.
-wire::Reason HTTPSPostBackend::keep(std::int32_t method, EventBatch::Event event,
-                                    platform::MemoryAccount* account, std::uint64_t sessionIDChanges) {
-  auto charge = account ? account->keep(event.size.charged) : platform::Charge();
-  if (!charge) return wire::Reason::event_over_share;
+  Sent sent{{reports ? wire::Fate::batched : wire::Fate::held, verdict.reason}, std::move(flushed)};
+  _counters.count(charge ? wire::Reason::event_batched : wire::Reason::event_over_share);
+  if (!charge) {
+    sent.decision = settled(message, {wire::Fate::dropped, wire::Reason::event_over_share}).decision;
+    return sent;
+  }
   if (account && !std::exchange(_evictable, true)) account->add(_held);
-  _held->add(method, std::move(event), std::move(*charge), sessionIDChanges);
-  return wire::Reason::event_batched;
+  _held->add(method, {std::move(event.text), size, account ? account->nextTurn() : 0, event.settled},
+             std::move(*charge), sessionIDChanges, reports ? wire::Step::batched : wire::Step::held,
+             stepOf(message));
+  return sent;
 }
 
 std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCompletion completion) {
   if (state() != kBackendReporting) {
-    _counters.count(wire::Reason::flushed_unreported, _held->discard());
+    _held->discard(wire::Reason::flushed_unreported);
   }
   if (_held->empty()) {
     if (completion) completion(std::nullopt, wire::makeReportingError("Nothing to flush", -1));
@@ -260,9 +259,12 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   noteUserInfo(*facts);
   HeldEvents::Taken taken = _held->take();
   const std::size_t count = taken.events.size();
+  wire::StepEntry fate;
+  fate.batch = taken.batch;
+  pen().write(wire::Step::flushed, std::nullopt, fate);
   config::EditedFields edits = std::exchange(_batchEdits, {});
   if (facts->sentUserInfo && !mergeUserInfo(taken, *facts, edits)) {
-    _posts.refusePost(*this, count, completion);
+    _posts.refusePost(*this, count, completion, fate);
     return std::nullopt;
   }
   std::vector<std::string> events;
@@ -281,18 +283,21 @@ std::optional<std::string> HTTPSPostBackend::flushMessagesWithCompletion(FlushCo
   }
   _posts.postJSONMessage(shared_from_this(), *facts, _clientState.links().postURL(),
                          {std::move(posted.text), std::nullopt, count, std::move(taken.charge),
-                          completionBytes, std::move(whenPosted), about(*facts, edits)});
+                          completionBytes, std::move(whenPosted), about(*facts, edits), fate});
   return pretty;
 }
 
 bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts,
                                      config::EditedFields& edits) {
   Dictionary info = *facts.sentUserInfo;
-  count(_clientState.filters().filterEvent(info, edits));
+  config::EditedFields own;
+  count(_clientState.filters().filterEvent(info, own));
+  edits.add(own);
   addOwnersEdits(facts, {}, edits);
   const auto unsettled = static_cast<std::size_t>(std::count_if(
       taken.events.begin(), taken.events.end(), [](const auto& event) { return !event.settled; }));
   if (unsettled == 0) return true;
+  noteMerge(facts, own, taken.batch);
   const std::size_t more = unsettled * sizeOfEvent(eventText(info)).charged;
   if (facts.account && !facts.account->keepMore(taken.charge, more)) return false;
   // The events themselves were restricted when they were written.
@@ -305,6 +310,32 @@ bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFact
     });
   }
   return true;
+}
+
+void HTTPSPostBackend::noteEdits(const SessionFacts& facts, const NumberedMessage& message,
+                                 const config::EditedFields& edits) const {
+  if (edits.empty() && !facts.userInfoEdits) return;
+  config::NotedChanges changes(
+      pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
+  if (facts.userInfoEdits) changes.changed(*facts.userInfoEdits);
+  changes.changed(edits);
+}
+
+// The user info was filtered without the methods and statuses of the events, so that a field that an event's
+// own filter had changed may leave as it is.
+void HTTPSPostBackend::noteMerge(const SessionFacts& facts, const config::EditedFields& edits,
+                                 std::uint64_t batch) const {
+  if (!pen().writes()) return;
+  const config::EditedFields* kept = facts.userInfoEdits.get();
+  config::NotedChanges changes(pen(), {.time = pen().ring()->now(), .batch = batch});
+  for (const auto& [name, value] : *facts.sentUserInfo) {
+    if (edits.removed.contains(name)) continue;
+    if (edits.hashed.contains(name) || (kept && kept->hashed.contains(name))) {
+      changes.changed(config::FieldChange::hashed, name);
+    } else if (_clientState.filters().concerns(name)) {
+      changes.restored(name);
+    }
+  }
 }
 
 JSONMessage HTTPSPostBackend::createMessage(std::vector<std::string> events,

@@ -28,6 +28,7 @@ struct HTTPSPostMaking {
   platform::Locale& locale;
   platform::Counters& counters;
   EventPosts& posts;
+  platform::FatePen pen;
   PostIdentity::Sources identity;
   // Null: the owner sets no limits.
   config::OwnerGate* gate = nullptr;
@@ -64,13 +65,17 @@ class HTTPSPostBackend final : public VeltraBackend {
   void count(const FilterTable::Outcome& outcome) const;
   WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& message);
   void noteUserInfo(const SessionFacts& facts);
-  Sent batchEvent(WrittenEvent event, platform::MemoryAccount* account, std::uint64_t sessionIDChanges);
-  wire::Reason keep(std::int32_t method, EventBatch::Event event, platform::MemoryAccount* account,
-                    std::uint64_t sessionIDChanges);
+  Sent batchEvent(WrittenEvent event, const NumberedMessage& message, platform::MemoryAccount* account,
+                  std::uint64_t sessionIDChanges);
   Sent postEvent(WrittenEvent event, const SessionFacts& facts, const NumberedMessage& message);
   // Merges the present user info into the events. False if there is no memory for it.
   bool mergeUserInfo(HeldEvents::Taken& taken, const SessionFacts& facts, config::EditedFields& edits);
   JSONMessage createMessage(std::vector<std::string> events, const SessionFacts& facts) const;
+  ClientMatch clientMatch() const override { return _clientState.match(); }
+  // For the record of fates: what was changed in an event, and then by the user info of a flush.
+  void noteEdits(const SessionFacts& facts, const NumberedMessage& message,
+                 const config::EditedFields& edits) const;
+  void noteMerge(const SessionFacts& facts, const config::EditedFields& edits, std::uint64_t batch) const;
   // For the history of what left, if one is kept: names of fields that the owner keeps back, too.
   bool recorded() const;
   void addOwnersEdits(const SessionFacts& facts, const MessageNote& note, config::EditedFields& edits) const;

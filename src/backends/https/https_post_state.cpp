@@ -30,10 +30,14 @@ StateVerdict HTTPSPostState::updateBackendState() {
     return matchClientNameAndServiceID(candidate, clientName, serviceName);
   });
   const bool found = entry != clients.end();
-  _entry = found ? std::optional(static_cast<std::size_t>(entry - clients.begin())) : std::nullopt;
+  _match = found ? ClientMatch{static_cast<std::size_t>(entry - clients.begin())}
+                 : nearestClient(clients, clientName, serviceName);
   if (found) applyExpedite(*entry);
   if (!facts->requireUserInfo) return reportForEveryone();
-  if (!userInfo) return counted(kBackendWaiting, wire::Reason::waits_for_user_info);
+  if (!userInfo) {
+    _match = {};
+    return counted(kBackendWaiting, wire::Reason::waits_for_user_info);
+  }
   if (!found) return counted(kBackendDisabled, wire::Reason::no_entry);
   // For log lines alone.
   const SharedDictionary& shown = facts->sentUserInfo;
@@ -47,9 +51,9 @@ StateVerdict HTTPSPostState::reportForEveryone() {
   const auto taken =
       std::find_if(clients.begin(), clients.end(),
                    [this](const config::ClientEntry& candidate) { return _links.updatePostLink(candidate); });
-  _entry.reset();
-  if (taken != clients.end()) _entry = static_cast<std::size_t>(taken - clients.begin());
-  resetBackendStateWithClient(taken == clients.end() ? nullptr : &*taken);
+  const bool none = taken == clients.end();
+  _match = none ? ClientMatch() : ClientMatch{static_cast<std::size_t>(taken - clients.begin())};
+  resetBackendStateWithClient(none ? nullptr : &*taken);
   return {kBackendReporting, wire::Reason::no_user_info_required};
 }
 

@@ -19,7 +19,7 @@
 namespace veltrad::backends {
 
 // Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. What an
-// update does not reach keeps its earlier value.
+// update does not reach keeps its earlier value. Its 13 fields are the profile, the services and the results.
 class HTTPSPostState {
  public:
   // `profile` has "clients".
@@ -44,8 +44,10 @@ class HTTPSPostState {
   const FilterTable& filters() const { return _filters; }
   std::int32_t eventThreshold() const { return _eventThreshold; }
   // The number of the client entry that holds; nothing: none does.
-  std::optional<std::size_t> entry() const { return _entry; }
+  std::optional<std::size_t> entry() const { return _match.entry; }
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
+  // Of the client entry that decides, or, if the session requires no user info, has given the address.
+  const ClientMatch& match() const { return _match; }
 
  private:
   void applyExpedite(const config::ClientEntry& entry);
@@ -69,8 +71,8 @@ class HTTPSPostState {
   // From an entry's "expedite".
   std::optional<bool> _batchEvents;
   std::int32_t _eventThreshold = 49;
-  std::optional<std::size_t> _entry;
   std::optional<double> _overrideSampling;
+  ClientMatch _match;
 };
 
 }  // namespace veltrad::backends

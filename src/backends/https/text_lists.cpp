@@ -31,4 +31,17 @@ bool matchClientNameAndServiceID(const config::ClientEntry& entry,
          matchStringWithList(entry.service, serviceID, true);
 }
 
+ClientMatch nearestClient(const std::vector<config::ClientEntry>& clients,
+                          const std::optional<std::string>& clientName,
+                          const std::optional<std::string>& serviceID) {
+  ClientMatch nearest;
+  for (std::size_t i = 0; i < clients.size(); ++i) {
+    const bool client = !matchExactStringWithList(clients[i].client, clientName, true);
+    const bool service = !matchStringWithList(clients[i].service, serviceID, true);
+    if (!nearest.nearest || (!client || !service) > (!nearest.clientDiffers || !nearest.serviceDiffers))
+      nearest = {std::nullopt, i, client, service};
+  }
+  return nearest;
+}
+
 }  // namespace veltrad::backends

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "backends/client_match.h"
 #include "config/client_entry.h"
 
 namespace veltrad::backends {
@@ -22,5 +23,10 @@ bool matchStringWithList(const std::vector<std::string>& list, const std::option
 bool matchClientNameAndServiceID(const config::ClientEntry& entry,
                                  const std::optional<std::string>& clientName,
                                  const std::optional<std::string>& serviceID);
+
+// None of the entries fits; the nearest is the first of those that lack least.
+ClientMatch nearestClient(const std::vector<config::ClientEntry>& clients,
+                          const std::optional<std::string>& clientName,
+                          const std::optional<std::string>& serviceID);
 
 }  // namespace veltrad::backends

@@ -40,27 +40,27 @@ void MivoBackend::loadAdaptor() {
 Sent MivoBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {
     _counters.count(wire::Reason::backend_disabled);
-    return {{wire::Fate::dropped, *forbidden}, std::nullopt};
+    return settled(message, {wire::Fate::dropped, *forbidden});
   }
   if (!_mivoAdaptor || !_mivoAdaptor->respondsToSelector(VELTRA_ADAPTOR_SEND)) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s does not respond to forwarding selector %s",
              _mivoAdaptor ? _mivoAdaptor->description().c_str() : "(null)", VELTRA_ADAPTOR_SEND);
-    return dropped(_mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
+    return dropped(message, _mivoAdaptor ? wire::Reason::adaptor_takes_none : wire::Reason::no_adaptor);
   }
   const auto thrown = _mivoAdaptor->perform(VELTRA_ADAPTOR_SEND, message.method, message.respCode,
                                             message.payload ? &*message.payload : nullptr);
   if (thrown) {
     logError("MivoBackend(sendMessage): Mivo adaptor %s threw: %s", _mivoAdaptor->description().c_str(),
              thrown->c_str());
-    return dropped(wire::Reason::adaptor_threw);
+    return dropped(message, wire::Reason::adaptor_threw);
   }
   _counters.count(wire::Reason::handed_to_adaptor);
-  return {{wire::Fate::delivered, wire::Reason::always}, std::nullopt};
+  return settled(message, {wire::Fate::delivered, wire::Reason::always});
 }
 
-Sent MivoBackend::dropped(wire::Reason why) const {
+Sent MivoBackend::dropped(const NumberedMessage& message, wire::Reason why) {
   _counters.count(why);
-  return {{wire::Fate::dropped, why}, std::nullopt};
+  return settled(message, {wire::Fate::dropped, why});
 }
 
 }  // namespace veltrad::backends

@@ -31,7 +31,7 @@ class MivoBackend final : public VeltraBackend {
   MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
               const std::string& name, const std::string& productFamily);
   void loadAdaptor();
-  Sent dropped(wire::Reason why) const;
+  Sent dropped(const NumberedMessage& message, wire::Reason why);
 
   platform::Counters& _counters;
   CodeBundle& _clientBundle;

@@ -73,12 +73,15 @@ UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name
       _scratchDirectory(making.scratchDirectory),
       _uploadURL(uploadURL) {}
 
-bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken) {
+bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken,
+                                     const MessageNote& note) {
+  _fate = {};
+  _fate.message = note.number;
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
   if (prohibition()) {
     logError("UploadBackend(uploadFileAtPath): File %s stays: the owner of the device does not let it leave",
              path.c_str());
-    _counters.count(wire::Reason::file_refused_by_owner);
+    drop(wire::Reason::file_refused_by_owner);
     return false;
   }
   const auto lent = _lentFiles.consume(extensionToken);
@@ -95,10 +98,11 @@ bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string&
   auto request = uploadRequest(_uploadURL, facts->device.udid, facts->sessionID, path);
   if (!request) {
     logError("UploadBackend(uploadFileAtPath): Unable to create URL request");
-    _counters.count(wire::Reason::file_bad_address);
+    drop(wire::Reason::file_bad_address);
     return false;
   }
   gzipped.become(*request);
+  notePost(*request);
   request->client = facts->client;
   request->about = aboutDeparture(name(), *facts, std::nullopt, {});
   place->requests();
@@ -113,21 +117,21 @@ std::optional<FileSnapshot> UploadBackend::fileToUpload(const platform::LentFile
   const auto file = FileSnapshot::of(lent ? lent->descriptor() : -1);
   if (!file) {
     logError("UploadBackend(uploadFileAtPath): Only upload a regular file.");
-    _counters.count(wire::Reason::file_not_regular);
+    drop(wire::Reason::file_not_regular);
     return std::nullopt;
   }
   if (file->size() > FileSnapshot::kMostBytes) {
     logError("UploadBackend(uploadFileAtPath): File %s has %lld bytes: at most %lld are uploaded",
              path.c_str(), static_cast<long long>(file->size()),
              static_cast<long long>(FileSnapshot::kMostBytes));
-    _counters.count(wire::Reason::file_too_large);
+    drop(wire::Reason::file_too_large);
     return std::nullopt;
   }
   const auto content = file->content();
   if (content == FileSnapshot::Content::some) return file;
   if (content == FileSnapshot::Content::unreadable) sayUnreadable(path, errno);
   logError("UploadBackend(uploadFileAtPath): Input file is empty");
-  _counters.count(wire::Reason::file_empty);
+  drop(wire::Reason::file_empty);
   return std::nullopt;
 }
 
@@ -140,7 +144,7 @@ bool UploadBackend::comesFromOthers(const platform::LentFile* lent, const std::s
       "UploadBackend(uploadFileAtPath): File %s lies on a file system of type %s, whose reads may never "
       "end: only a copy of it can be uploaded",
       path.c_str(), origin.fileSystem.c_str());
-  _counters.count(wire::Reason::file_foreign);
+  drop(wire::Reason::file_foreign);
   return true;
 }
 
@@ -168,21 +172,42 @@ bool UploadBackend::compress(FileSnapshot& file, const std::string& path, Compre
     return false;
   };
   if (support::gzipDeflate(next, keep)) return true;
-  if (fate) _counters.count(*fate);
+  if (fate) drop(*fate);
   return false;
 }
 
 void UploadBackend::sayStopping() const {
   logError("UploadBackend(uploadFileAtPath): The daemon is stopping");
-  _counters.count(wire::Reason::file_stopped);
+  drop(wire::Reason::file_stopped);
+}
+
+void UploadBackend::drop(wire::Reason why) const {
+  _counters.count(why);
+  pen().write(wire::Step::dropped, why, _fate);
+}
+
+void UploadBackend::notePost(const http::HTTPRequest& request) {
+  _fate.post = pen().newNumber();
+  _fate.text = pen().textOf(request.url);
+  _fate.bytes = static_cast<std::uint32_t>(request.fileBody ? request.fileBody->bytes : request.body.size());
+  _fate.events = 1;
+  pen().write(wire::Step::posted, std::nullopt, _fate);
 }
 
 // Also logs and counts how the exchange ended.
-bool UploadBackend::confirms(const http::HTTPResult& answer) const {
-  if (!answer.ok() || answer.value().body.empty()) {
-    logError("UploadBackend(uploadFileAtPath): post %s",
-             answer.ok() ? "(null)" : answer.error().description.c_str());
-    _counters.count(answer.ok() ? wire::Reason::file_not_confirmed : fateAfter(answer.error().kind));
+bool UploadBackend::confirms(const http::HTTPResult& answer) {
+  if (!answer) {
+    logError("UploadBackend(uploadFileAtPath): post %s", answer.error().description.c_str());
+    const wire::Reason why = fateAfter(answer.error().kind);
+    _counters.count(why);
+    pen().write(answer.error().mayHaveArrived() ? wire::Step::lost : wire::Step::dropped, why, _fate);
+    return false;
+  }
+  _fate.status = static_cast<std::uint16_t>(answer.value().status);
+  if (answer.value().body.empty()) {
+    logError("UploadBackend(uploadFileAtPath): post (null)");
+    _counters.count(wire::Reason::file_not_confirmed);
+    pen().write(wire::Step::answered, wire::Reason::file_not_confirmed, _fate);
     return false;
   }
   const std::string& body = answer.value().body;
@@ -190,7 +215,9 @@ bool UploadBackend::confirms(const http::HTTPResult& answer) const {
   logDebug("UploadBackend(uploadFileAtPath): sending to |%s|, Json output: %s", _uploadURL.c_str(),
            text ? body.c_str() : "(undecodable)");
   const bool confirmed = text && body.find(kConfirmation) != std::string::npos;
-  _counters.count(confirmed ? wire::Reason::file_uploaded : wire::Reason::file_not_confirmed);
+  const wire::Reason end = confirmed ? wire::Reason::file_uploaded : wire::Reason::file_not_confirmed;
+  _counters.count(end);
+  pen().write(wire::Step::answered, end, _fate);
   return confirmed;
 }
 

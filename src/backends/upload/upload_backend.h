@@ -40,7 +40,8 @@ class UploadBackend final : public VeltraBackend {
 
   // True if the request was made, whatever the result: only the answer decides whether the client is asked to
   // remove its file. Otherwise an error line says why not.
-  bool uploadFileAtPath(const std::string& path, const std::string& extensionToken) override;
+  bool uploadFileAtPath(const std::string& path, const std::string& extensionToken,
+                        const MessageNote& note) override;
   std::vector<std::string> hosts() const override { return {http::hostName(_uploadURL)}; }
 
  private:
@@ -50,8 +51,11 @@ class UploadBackend final : public VeltraBackend {
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
   bool compress(FileSnapshot& file, const std::string& path, CompressedFile& into) const;
-  bool confirms(const http::HTTPResult& answer) const;
+  bool confirms(const http::HTTPResult& answer);
   void sayStopping() const;
+  // Counts why the file does not leave.
+  void drop(wire::Reason why) const;
+  void notePost(const http::HTTPRequest& request);
   void remove(const platform::LentFile& lent, const FileSnapshot& file, const std::string& path) const;
 
   FileUploads& _uploads;
@@ -60,6 +64,9 @@ class UploadBackend final : public VeltraBackend {
   platform::Counters& _counters;
   const std::string _scratchDirectory;
   const std::string _uploadURL;
+
+  // The session's thread only: what the record of fates says of the upload under way.
+  wire::StepEntry _fate;
 };
 
 }  // namespace veltrad::backends

@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "base/text.h"
+#include "tools/ctl/fate_options.h"
 
 namespace veltrad::ctl {
 
@@ -120,6 +121,7 @@ void addCare(CLI::App& app, Options& options) {
   addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text")
       ->group(kCareGroup)
       ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
+  addFates(app, options);
   addConfig(app, options);
   addRefreshAndReport(app, options);
   addDoctor(app, options);

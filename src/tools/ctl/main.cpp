@@ -14,6 +14,7 @@
 #include "tools/ctl/session_command.h"
 #include "tools/ctl/stats_command.h"
 #include "tools/ctl/status_command.h"
+#include "tools/ctl/why_command.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -45,6 +46,10 @@ int run(int argc, char** argv) {
       return runRefresh(options);
     case Command::report:
       return runReport(options);
+    case Command::why:
+      return runWhy(options);
+    case Command::watch:
+      return runWatch(options, interrupt);
     case Command::privacy:
     case Command::privacyOff:
     case Command::privacyOn:

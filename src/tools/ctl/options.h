@@ -10,6 +10,7 @@
 
 #include "base/value.h"
 #include "tools/command_line.h"
+#include "tools/ctl/fate_filter.h"
 
 namespace veltrad::ctl {
 
@@ -51,7 +52,9 @@ enum class Command {
   privacyReset,
   history,
   historyShow,
-  historyPurge
+  historyPurge,
+  why,
+  watch
 };
 
 // Of the commands for those who look after a device.
@@ -69,6 +72,9 @@ struct Care {
   bool raw = false;
   // history: the page to write.
   std::optional<std::string> html;
+  // why, watch.
+  FateFilter fates;
+  std::size_t last = 20;
 };
 
 // Its 13 fields are the command's options and arguments, by name.

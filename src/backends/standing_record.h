@@ -1,0 +1,30 @@
+// SPDX-License-Identifier: Apache-2.0
+// What the record of fates says of how a back end stands. The session's thread.
+#pragma once
+
+#include <cstdint>
+
+#include "platform/fate_pen.h"
+
+namespace veltrad::backends {
+
+// One entry serves many messages, until the back end stands otherwise, or the entry is so old that it would
+// be overwritten before those that refer to it.
+class StandingRecord {
+ public:
+  wire::FateRef of(const platform::FatePen& pen, const wire::StandingEntry& now) {
+    if (!pen.writes()) return 0;
+    const wire::FateWords words = wire::wordsOf(now);
+    if (words != _last || !pen.ring()->fresh(_position)) {
+      _last = words;
+      _position = pen.ring()->write(now);
+    }
+    return platform::FateRing::refTo(_position);
+  }
+
+ private:
+  std::uint64_t _position = 0;  // 0: nowhere
+  wire::FateWords _last{};
+};
+
+}  // namespace veltrad::backends

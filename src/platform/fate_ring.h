@@ -1,0 +1,107 @@
+// SPDX-License-Identifier: Apache-2.0
+// The record of fates: what was decided for messages and what became of them, in a ring of fixed size. Any
+// thread, without locks, and nothing is allocated after construction.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "platform/clock.h"
+#include "wire/fate_entries.h"
+
+namespace veltrad::platform {
+
+// Entries stand in the order in which they were written; the oldest are overwritten. A position counts
+// entries from 1 and is never used again. An entry refers to others, such as texts, only if they are at most
+// refresh() older, so that it knows them as long as it stands, but for the oldest few entries of the ring.
+class FateRing {
+ public:
+  static constexpr std::size_t kDefaultBytes = 512u << 10;
+  static constexpr std::size_t kLeastBytes = 64u << 10;
+  static constexpr std::size_t kMostBytes = 256u << 20;
+  static constexpr std::size_t kLongestText = 2048;
+
+  // `bytes`, within the bounds above, hold entries, texts and the table that finds texts again. The clock
+  // outlives the ring.
+  FateRing(std::size_t bytes, const Clock& clock);
+
+  // Microseconds since 1970.
+  static std::int64_t microseconds(TimeValue time) { return time.seconds * 1'000'000 + time.microseconds; }
+  std::int64_t now() const { return microseconds(_clock.now()); }
+  // From 1. Those of batches, posts, files and log data have no gaps to speak of and mean nothing.
+  std::uint64_t nextMessage() { return _messages.fetch_add(1, std::memory_order_relaxed) + 1; }
+  std::uint64_t nextNumber() { return _numbers.fetch_add(1, std::memory_order_relaxed) + 1; }
+  std::uint64_t messages() const { return _messages.load(std::memory_order_relaxed); }
+
+  // Returns the entry's position.
+  template <typename Entry>
+  std::uint64_t write(const Entry& entry) {
+    const std::uint64_t position = claim(1);
+    put(position, wire::wordsOf(entry));
+    return position;
+  }
+  // The position of the text, which is written anew unless it stands in the ring and is fresh. What is longer
+  // than kLongestText is cut.
+  std::uint64_t intern(std::string_view text);
+  static wire::FateRef refTo(std::uint64_t position) { return static_cast<wire::FateRef>(position); }
+  // Whether a new entry may refer to the one at this position.
+  bool fresh(std::uint64_t position) const {
+    return position != 0 && _next.load(std::memory_order_relaxed) - position <= _refresh;
+  }
+
+  // For readers, who may fall behind.
+  struct Copy {
+    std::string entries;     // for each its position and its words: 8 numbers of 8 bytes in the host's order
+    std::uint64_t next = 0;  // where to go on
+    std::uint64_t missing = 0;  // entries before `next` that could not be read any more
+  };
+  // If `patient`, stops at a new entry that is not written yet; else passes over it, for the case that it was
+  // given up.
+  Copy copy(std::uint64_t from, std::size_t most, bool patient = true) const;
+  // The position of the next entry.
+  std::uint64_t next() const { return _next.load(std::memory_order_acquire); }
+  std::size_t size() const { return _size; }
+  std::size_t refresh() const { return _refresh; }
+
+ private:
+  // Of the table that finds texts again.
+  static constexpr std::size_t kWays = 4;
+  static constexpr std::size_t kBuckets = 128;
+  static constexpr std::size_t kTableBytes = kWays * kBuckets * sizeof(std::uint64_t);
+  // A word that says which entry stands there, and the entry.
+  static constexpr std::size_t kSlotWords = 1 + wire::kFateWords;
+  static constexpr std::size_t kSlotBytes = kSlotWords * sizeof(std::uint64_t);
+
+  struct Free {
+    void operator()(std::uint64_t* memory) const { std::free(memory); }
+  };
+
+  std::uint64_t claim(std::size_t entries) { return _next.fetch_add(entries, std::memory_order_relaxed); }
+  void put(std::uint64_t position, const wire::FateWords& words);
+  // False if another entry stands there.
+  bool read(std::uint64_t position, wire::FateWords& words) const;
+  bool holds(std::uint64_t position, const wire::TextEntry& first, std::string_view rest) const;
+  std::span<std::uint64_t> slot(std::uint64_t position) const {
+    return {_slots + position % _size * kSlotWords, kSlotWords};
+  }
+
+  const Clock& _clock;
+  const std::size_t _size;  // in entries
+  const std::size_t _refresh;
+  // All zeros, which the system gives as they are first used.
+  const std::unique_ptr<std::uint64_t[], Free> _memory;
+  std::uint64_t* const _slots;
+  std::uint64_t* const _texts;
+
+  alignas(64) std::atomic<std::uint64_t> _next{1};
+  std::atomic<std::uint64_t> _messages{0};
+  std::atomic<std::uint64_t> _numbers{0};
+};
+
+}  // namespace veltrad::platform

@@ -1,0 +1,60 @@
+// SPDX-License-Identifier: Apache-2.0
+// Writes a session's messages, files and log data into the record of fates as they are taken in. The
+// session's thread.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "backends/backend.h"
+#include "config/storebag_content.h"
+#include "platform/fate_pen.h"
+#include "session/backend_set.h"
+
+namespace veltrad::session {
+
+struct FamilyFacts;
+struct Message;
+
+class SessionFates {
+ public:
+  using From = wire::MessageEntry::From;
+  using Item = wire::MessageEntry::Item;
+
+  // Null: nothing is recorded. The ring outlives it.
+  explicit SessionFates(platform::FateRing* ring) : _pen(ring, {}) {}
+
+  // The back ends that are made from now on come from there and report this session info, whatever the
+  // session is told later. Returns, to be filled, which were not made.
+  NotMade* comesFrom(const config::StorebagOrigin& origin, backends::SharedDictionary sessionInfo);
+  // What the session is has changed.
+  void forget() { _session = 0; }
+  // The record knows the session; if not, describe() must follow before anything else.
+  bool described() const { return !_pen.writes() || _pen.ring()->fresh(_session); }
+  // `from` says whether the facts are those of a message without a session of its own.
+  void describe(const FamilyFacts& facts, From from);
+
+  // Sets the message's note; `edits` is what the owner keeps back of its payload. Without `edits` it reached
+  // no back end, for `reason`. The time of a message that has none is now.
+  void taken(Message& message, From from, const config::EditedFields* edits,
+             std::optional<wire::Reason> reason = std::nullopt);
+  // It reached no back end.
+  void refused(const FamilyFacts& facts, Message message, From from, wire::Reason why);
+  // A file or log data.
+  backends::MessageNote taken(Item item);
+  // `to`: the session whose client gets a copy.
+  void aggregated(const Message& message, const std::string& to) const;
+
+ private:
+  const platform::FatePen _pen;
+  // Position of the entry that tells of the session; 0: none.
+  std::uint64_t _session = 0;
+  config::StorebagOrigin _origin;
+  backends::SharedDictionary _sessionInfo;  // null before there are back ends
+  NotMade _notMade;
+};
+
+}  // namespace veltrad::session

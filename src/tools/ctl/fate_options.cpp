@@ -1,0 +1,97 @@
+// SPDX-License-Identifier: Apache-2.0
+// Which messages are asked for.
+#include "tools/ctl/fate_options.h"
+
+#include <fmt/format.h>
+
+#include <CLI/CLI.hpp>
+#include <charconv>
+#include <limits>
+
+#include "base/text.h"
+#include "tools/ctl/care_options.h"
+#include "wire/fates.h"
+
+namespace veltrad::ctl {
+namespace {
+
+constexpr const char* kWhich = "Which messages";
+
+template <typename T>
+struct NumberOf {
+  using Type = T;
+};
+template <typename T>
+struct NumberOf<std::optional<T>> {
+  using Type = T;
+};
+
+template <typename T>
+void addNumber(CLI::App& command, const std::string& name, T& target, const std::string& help,
+               const char* group = kWhich) {
+  const auto read = [name, &target](const std::string& text) {
+    using Number = typename NumberOf<T>::Type;
+    Number number = 0;
+    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    if (error != std::errc() || end != text.data() + text.size()) {
+      throw CLI::ValidationError(name, fmt::format("expected an integer from {} to {}, found \"{}\"",
+                                                   std::numeric_limits<Number>::min(),
+                                                   std::numeric_limits<Number>::max(), escapedForLog(text)));
+    }
+    target = number;
+  };
+  command.add_option_function<std::string>(name, read, help)->type_name("N")->group(group);
+}
+
+std::string backendProblem(const std::string& text) {
+  if (!text.empty()) return {};
+  return "expected the name of a back end, such as httppost";
+}
+
+void addFilters(CLI::App& command, FateFilter& filter) {
+  addNumber(command, "--message", filter.message, "The message with this number");
+  addNumber(command, "--client-type", filter.clientType, "Of clients of this type");
+  addNumber(command, "--session-id", filter.sessionID, "Of sessions to which their clients gave this number");
+  addNumber(command, "--client-version", filter.clientVersion, "Of clients of this version");
+  addNumber(command, "--category", filter.category, "Of this category");
+  addNumber(command, "--type", filter.type, "Of this type");
+  addNumber(command, "--flag", filter.flag, "With this flag");
+  const auto addText = [&](const std::string& name, std::optional<std::string>& target,
+                           const std::string& help) {
+    return command.add_option(name, target, help)->type_name("NAME")->group(kWhich);
+  };
+  addText("--client", filter.client, "Of the client with exactly this name");
+  addText("--service", filter.service, "Of the service with exactly this name");
+  addText("--backend", filter.backend, "That came to this back end, which alone is shown")
+      ->check(CLI::Validator(backendProblem, ""));
+  command.add_flag("--uploads", filter.uploads, "Files and log data instead of messages")->group(kWhich);
+}
+
+}  // namespace
+
+void addFates(CLI::App& app, Options& options) {
+  constexpr const char* kCare = "Looking after a device";
+  CLI::App* why =
+      addCommand(app, options, Command::why, "why", "Tell what became of messages, and why")->group(kCare);
+  addFilters(*why, options.care.fates);
+  addNumber(*why, "--last", options.care.last, "At most so many, the newest that fit; 20 without it",
+            "Options");
+  why->footer(
+      "For each message: when, who, category and type, and for each back end its state and why, the whole\n"
+      "road, and where the message is now. The daemon keeps a record of bounded size (\"fates\" in\n"
+      "settings.json, veltrad(5)) and says what it no longer holds. Contents of messages are not in it, nor "
+      "are\n"
+      "values of fields, only the names of those that were removed or hashed.\n\n"
+      "Examples:\n  veltractl why --client lamp --last 3\n  veltractl why --category 5 --backend httppost "
+      "--json");
+  CLI::App* watch =
+      addCommand(app, options, Command::watch, "watch", "Tell the same as it happens, until interrupted")
+          ->group(kCare);
+  addFilters(*watch, options.care.fates);
+  watch->footer(
+      "One line for each message and each of its steps. What was overwritten before it could be read is "
+      "counted\n"
+      "and said.\n\nExample:\n  veltractl watch --client lamp --json");
+}
+
+}  // namespace veltrad::ctl
