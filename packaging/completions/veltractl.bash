@@ -3,10 +3,10 @@ _veltractl() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]} path="" words="" given=0 i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output | --html) ((i++)) ; continue ;;
+      --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | --message | --backend | --last | -o | --output | --html) ((i++)) ; continue ;;
     esac
     case $path+${COMP_WORDS[i]} in
-      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats | +privacy | /privacy+off | /privacy+on | /privacy+reset-identifiers | +history | /history+show | /history+purge) path+=/${COMP_WORDS[i]} ;;
+      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +why | +watch | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats | +privacy | /privacy+off | /privacy+on | /privacy+reset-identifiers | +history | /history+show | /history+purge) path+=/${COMP_WORDS[i]} ;;
       *+-*) ;;
       *) ((given++)) ;;
     esac
@@ -15,7 +15,7 @@ _veltractl() {
   case $previous in
     --input | -o | --output | --html) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -f -- "$current"); return ;;
     --root) compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- "$current"); return ;;
-    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | -o | --output | --html) return ;;
+    --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | --message | --backend | --last | -o | --output | --html) return ;;
   esac
   case $path in
     "/session") words=" --aggregate --input --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
@@ -27,6 +27,8 @@ _veltractl() {
     "/upload-log-data") words=" --client-type --session-id --client-version --client --service --user-info --require-user-info --batch-events" ;;
     "/status") words=" --watch" ;;
     "/metrics") words="" ;;
+    "/why") words=" --message --client-type --session-id --client-version --category --type --flag --client --service --backend --uploads --last" ;;
+    "/watch") words=" --message --client-type --session-id --client-version --category --type --flag --client --service --backend --uploads" ;;
     "/config/get") words="" ;;
     "/config/set") words="" ;;
     "/config/unset") words="" ;;
@@ -42,7 +44,7 @@ _veltractl() {
     "/history/show") words=" --raw" ;;
     "/history/purge") words="" ;;
     "/history") words=" --html show purge" ;;
-    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics config refresh report doctor stats privacy history" ;;
+    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics why watch config refresh report doctor stats privacy history" ;;
   esac
   [[ $path == "" ]] || words+=" --root --json --version -h --help"
   if [[ $current != -* ]]; then

@@ -227,7 +227,7 @@ TEST(Families, NoCopyFollowsTheEnd) {
       for (int i = 0; i < kSent; ++i) sent += world.families.sendToAncestor(child.place(), "copy").taken;
     });
     std::thread own([&] {
-      for (int i = 0; i < kSent; ++i) sent += middle.aggregation->sendToAggregator("copy").taken;
+      for (int i = 0; i < kSent; ++i) sent += middle.aggregation->sendToAggregator("copy", "B1").taken;
     });
     while (sent == 0) std::this_thread::yield();
     root.aggregation->setActive(true);
