@@ -17,7 +17,7 @@
 namespace veltrad::storebag {
 namespace {
 
-constexpr std::int64_t kMostCode = 65'535;
+constexpr std::int64_t kMostMessageCode = 65'535;
 
 std::string pathBeside(const std::string& directory, const std::string& path) {
   return path.starts_with('/') || directory.empty() ? path : directory + "/" + path;
@@ -180,10 +180,10 @@ Result<GivenMessage, std::string> messageOf(const Value& value) {
   for (const auto& [key, number] : {std::pair(wire::kVeltraMessageParametersCategory, &given.category),
                                     std::pair(wire::kVeltraMessageParametersType, &given.type)}) {
     const Value* item = message->find(key);
-    const auto code = item ? wholeNumber(*item, 0, kMostCode) : std::nullopt;
+    const auto code = item ? wholeNumber(*item, 0, kMostMessageCode) : std::nullopt;
     if (!code)
       return Failure{fmt::format("\"{}\" is {}: expected an integer from 0 to {}", key,
-                                 item ? shownValue(*item) : "missing", kMostCode)};
+                                 item ? shownValue(*item) : "missing", kMostMessageCode)};
     *number = static_cast<std::uint16_t>(*code);
   }
   given.flag = message->int32(wire::kVeltraMessageParametersFlag).value_or(0);
