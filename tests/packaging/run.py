@@ -38,6 +38,7 @@ class Box:
 
     def __init__(self, base):
         self.path, self.boot = Path(tempfile.mkdtemp(prefix="box-")), None
+        self.path.chmod(0o755)  # its root is for its other users, too
         made = ["debootstrap", "--variant=minbase", self.suite(), str(self.path), *self.mirror()]
         subprocess.run(["cp", "-a", f"{base}/.", str(self.path)] if base else made, check=True, stdout=subprocess.DEVNULL)
         shutil.rmtree(self.path / "etc/apt")
