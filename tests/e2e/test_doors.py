@@ -131,8 +131,8 @@ class Crowd(SystemTest):
                 for one in crowd:
                     one.kill()
                     one.join()
-            # 0.1 s on an idle machine; here other tests run at the same time.
-            self.assertLess(sorted(waits)[-3], 0.1 if BUILD.name == "release" else 0.3, "seconds to a greeting at the 99th percentile")
+            # 0.1 s on an idle machine; here other tests, and perhaps other builds, run at the same time.
+            self.assertLess(sorted(waits)[-3], 0.1 if BUILD.name == "release" else 1, "seconds to a greeting at the 99th percentile")
 
 
 class Stop(SystemTest):

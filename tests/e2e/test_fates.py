@@ -226,7 +226,9 @@ class RandomFates(FatesTest):
                 elif name == "dashboard":
                     came = datagrams.get((line["sessionID"], line["category"], backend["eventNumber"]), [])
                     self.assertEqual(bool(came), fate in LEFT, (came, *about))
-                    self.assertEqual(fate == "acknowledged", "acknowledged" in came, (came, *about))
+                    # One-shots of one connection share a socket, and all have the number 1: the answer may be another's.
+                    if line["from"] != "oneShot":
+                        self.assertEqual(fate == "acknowledged", "acknowledged" in came, (came, *about))
                     self.assertGreaterEqual(backend["transmissions"], len(came), about)
                 elif name == "ampery":
                     self.assertEqual(written.count(given["n"]), int(fate == "written"), about)

@@ -52,8 +52,9 @@ class Shortage(SystemTest):
             wait_until(lambda: self.refusal() is None, "a client that is served again")
 
     def test_files_are_read_again_after_a_shortage(self):
-        """Preferences, device properties, deployment, environment and key, none of which was read before."""
-        with self.serving("the device's identifiers", "until the settings can be read") as daemon:
+        """Preferences, device properties, deployment, environment and key, none of which was read before. Meanwhile the built-in
+        storebag serves, which names an adaptor."""
+        with self.serving("the device's identifiers", "Mivo adaptor") as daemon:
             client = Wire(self.root)
             client.describe()
             self.limit(daemon, 0)
