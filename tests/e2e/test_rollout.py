@@ -264,7 +264,7 @@ class Page(Rollout):
             done = subprocess.run(["bash", "-euc", command], cwd=where, env=env, capture_output=True, text=True, timeout=DEADLINE)
             return done.returncode, done.stdout + done.stderr
 
-        with self.serving("fetchStorebag", "Storebag 'quindle' refused: ") as daemon:
+        with self.serving("fetchStorebag", "Unable to fetch storebag", "Storebag 'quindle' refused: ") as daemon:
             session = None
             for indent, block in blocks:
                 block = "\n".join(line.removeprefix(indent) for line in block.split("\n"))
