@@ -39,7 +39,7 @@ std::string amounts(const Dictionary& of, std::initializer_list<const char*> key
   return all;
 }
 
-std::string orNothing(std::string text) {
+std::string orNothing(const std::string& text) {
   return text.empty() ? "nothing" : text;
 }
 
@@ -85,11 +85,10 @@ std::string formatReceipt(const Dictionary& answer) {
     const Dictionary* client = one.asDictionary();
     if (!client) continue;
     const std::string name = textIn(*client, "client"), service = textIn(*client, "service");
-    out += fmt::format("\n  of {}, session {}: {}",
-                       name.empty()      ? fmt::format("client type {}", numberIn(*client, "clientType"))
-                       : service.empty() ? name
-                                         : name + "/" + service,
-                       numberIn(*client, "sessionID"), amounts(*client, {"events", "datagrams", "files"}));
+    const std::string who = name.empty() ? fmt::format("client type {}", numberIn(*client, "clientType"))
+                                         : fmt::format("{}{}{}", name, service.empty() ? "" : "/", service);
+    out += fmt::format("\n  of {}, session {}: {}", who, numberIn(*client, "sessionID"),
+                       amounts(*client, {"events", "datagrams", "files"}));
   }
   const std::string begun = amounts(dictionary(answer, "underWay"), {"posts", "events", "files"});
   const Dictionary& disk = dictionary(answer, "onDisk");

@@ -77,9 +77,9 @@ std::optional<std::string> readUserInfo(const std::vector<std::string>& texts, G
 }
 
 std::optional<std::string> complete(const ExplainRequest& request, Given& given) {
-  if (const auto wrong = readUserInfo(request.userInfo, given)) return wrong;
-  if (const auto wrong = readDraws(request.draws, given)) return wrong;
-  if (const auto wrong = readFiles(request, given)) return wrong;
+  if (auto wrong = readUserInfo(request.userInfo, given)) return wrong;
+  if (auto wrong = readDraws(request.draws, given)) return wrong;
+  if (auto wrong = readFiles(request, given)) return wrong;
   return readMessage(request, given);
 }
 
