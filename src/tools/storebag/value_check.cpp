@@ -106,6 +106,8 @@ void ValueCheck::check(const Spot& at, const Key& key, const Value& value) const
       return checkTexts(at, key, *value.asArray());
     case KeyType::url:
       return checkAddress(at, key, *value.asString());
+    case KeyType::text:
+      return checkText(at, key, *value.asString());
     default:
       return;
   }
@@ -183,6 +185,20 @@ void ValueCheck::checkTexts(const Spot& at, const Key& key, const Array& texts) 
           "Take it out, or put it into quotes.");
     }
   }
+}
+
+// The name of a filtered field is compared whole, too.
+void ValueCheck::checkText(const Spot& at, const Key& key, const std::string& text) const {
+  if (key.name != std::string_view("key")) return;
+  const std::string_view bare = trimmed(text);
+  if (text.empty())
+    _sink.say(FindingName::empty_in_list, at, "\"key\" is empty, and no field has such a name",
+              "Write the name of the field, or take the filter out.");
+  else if (bare != text)
+    _sink.say(FindingName::blank_in_list, at,
+              fmt::format("\"key\" is {} with a blank, which is part of the name: the field leaves in clear",
+                          quoted(text)),
+              fmt::format("Write {}.", quoted(std::string(bare))));
 }
 
 void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& name) const {
