@@ -143,11 +143,11 @@ Result<StorebagSigners, StorebagTrust::Refusal> StorebagTrust::signersOf(const S
       return StorebagSigners{key.fingerprint(), ed25519SignersOf(container, bag.bag, keys.ed25519)};
   }
   logError("fetchStorebagWithName: Signature can not be verified, %p", keys.rsa.front().identity());
-  const std::string why = keys.rsa.size() == 1
-                              ? fmt::format("the signature is not by the key in {} (SHA-256 {})",
-                                            _veltra.publicKeyPath(), keys.rsa.front().fingerprint())
-                              : fmt::format("the signature is by none of the keys in {} and {} (SHA-256 {})",
-                                            _veltra.publicKeyPath(), _keysDirectory, fingerprintsOf(keys.rsa));
+  const std::string why =
+      keys.rsa.size() == 1 ? fmt::format("the signature is not by the key in {} (SHA-256 {})",
+                                         _veltra.publicKeyPath(), keys.rsa.front().fingerprint())
+                           : fmt::format("the signature is by none of the keys in {} and {} (SHA-256 {})",
+                                         _veltra.publicKeyPath(), _keysDirectory, fingerprintsOf(keys.rsa));
   return Failure{Refusal{Cause::signature, why, false}};
 }
 
