@@ -72,18 +72,31 @@ Outcome format(const FormatRequest& request);
 // Prints the JSON Schema of storebags.
 Outcome schema();
 
-// What explain is given besides what `given` holds already. Its 13 fields are its options.
+// For whom a storebag is played, and the files that say more of it.
+struct PlayedSession {
+  Given given;
+  std::optional<std::string> device, policy, messages;
+};
+
 struct ExplainRequest {
   std::string file;
-  Given given;
-  std::vector<std::string> userInfo, draws, payload;
-  std::optional<std::string> device, policy, messages, payloadFile;
+  PlayedSession session;
+  std::vector<std::string> payload;
+  std::optional<std::string> payloadFile;
   std::optional<std::uint16_t> category, type;
   std::int32_t flag = 0;
   bool json = false;
 };
 // Says what each back end does with the messages of such a session.
 Outcome explain(const ExplainRequest& request);
+
+struct DiffRequest {
+  std::string before, now;
+  PlayedSession session;
+  bool json = false;
+};
+// Says what changes between two states of a storebag; `findings`: more leaves devices than before.
+Outcome diff(const DiffRequest& request);
 
 struct TestRequest {
   std::vector<std::string> suites;

@@ -19,6 +19,7 @@ struct Arguments {
   LintRequest lint;
   FormatRequest format;
   ExplainRequest explain;
+  DiffRequest diff;
   TestRequest test;
   // Of the command, which runs while the arguments are parsed.
   Outcome outcome;
