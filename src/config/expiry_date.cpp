@@ -39,8 +39,11 @@ class Scan {
     double part = 0, worth = 0.1;
     if (!any(".")) return 0;
     if (_rest.empty() || !isDigit(_rest.front())) _fits = false;
-    for (; !_rest.empty() && isDigit(_rest.front()); _rest.remove_prefix(1), worth /= 10)
+    while (!_rest.empty() && isDigit(_rest.front())) {
       part += worth * (_rest.front() - '0');
+      worth /= 10;
+      _rest.remove_prefix(1);
+    }
     return part;
   }
   char front() const { return _rest.empty() ? '\0' : _rest.front(); }

@@ -155,7 +155,10 @@ class Memory(Rollout):
             self.assertEqual(self.refresh()["reason"], "serial 7 is lower than 8")
             self.serve(serial=9, key="old", ed25519=["old"])
             self.assertIn("is revoked", self.refresh()["reason"])
-            self.assertIsNone(self.open(TYPE)[1])
+            session, backends = self.open(TYPE)
+            self.assertIsNone(backends)
+            session.send(number=1)
+            self.assertIn('"storebag_key_revoked"', self.ctl("why", "--json", "--last", "1")[0])
         seen.write_bytes(good[:len(good) // 2])
         with self.serving(*FAILED):
             self.serve(serial=8)
@@ -264,7 +267,7 @@ class Page(Rollout):
             done = subprocess.run(["bash", "-euc", command], cwd=where, env=env, capture_output=True, text=True, timeout=DEADLINE)
             return done.returncode, done.stdout + done.stderr
 
-        with self.serving("fetchStorebag", "Storebag 'quindle' refused: ") as daemon:
+        with self.serving("fetchStorebag", "Unable to fetch storebag", "Storebag 'quindle' refused: ") as daemon:
             session = None
             for indent, block in blocks:
                 block = "\n".join(line.removeprefix(indent) for line in block.split("\n"))
