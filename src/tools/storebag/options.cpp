@@ -47,7 +47,10 @@ void describeKeys(CLI::App& app, Arguments& given) {
   keygen->add_option("--bits", given.bits, "Length of the modulus in bits")
       ->check(CLI::Range(SigningKey::kFewestBits, SigningKey::kMostBits))
       ->capture_default_str();
-  keygen->callback([&given] { given.outcome = storebag::keygen(given.directory, given.bits); });
+  keygen->add_flag("--ed25519", given.ed25519Key,
+                   "Create one for the second signature instead: DIR/ed25519.pem and DIR/ed25519.der");
+  keygen->callback(
+      [&given] { given.outcome = storebag::keygen(given.directory, given.bits, given.ed25519Key); });
 
   CLI::App* sign = addCommand(app, "sign", "Sign a storebag in which lint finds no errors");
   sign->add_option("--key", given.sign.privateKey, "Private key in PEM form")->type_name("FILE")->required();
@@ -55,13 +58,29 @@ void describeKeys(CLI::App& app, Arguments& given) {
   sign->add_option("-o,--output", given.sign.out, "The signed container to write")
       ->type_name("FILE")
       ->required();
+  sign->add_option("--ed25519", given.sign.ed25519,
+                   "Ed25519 private key that signs as well; repeat the option for more")
+      ->type_name("FILE")
+      ->allow_extra_args(false);
+  sign->add_option("--serial", given.sign.serial, "Write this serial into the storebag first")
+      ->type_name("N")
+      ->check(CLI::Range(std::int64_t{0}, std::int64_t{9'007'199'254'740'991}));
+  sign->add_option("--expires", given.sign.expires,
+                   "Write this date (2026-12-31) or date and time (RFC 3339) into it")
+      ->type_name("DATE");
+  sign->add_option("--name", given.sign.name, "Write the name that it is served under into it")
+      ->type_name("NAME");
   sign->add_flag("--force", given.sign.force, "Sign it in spite of errors");
   sign->callback([&given] { given.outcome = storebag::sign(given.sign); });
 
   CLI::App* verify = addCommand(app, "verify", "Verify a signed storebag as the daemon does");
   verify->add_option("--key", given.key, "Public key in DER form")->type_name("FILE")->required();
+  verify
+      ->add_option("--ed25519", given.ed25519,
+                   "Public key whose Ed25519 signature must be there, too, in DER or PEM form")
+      ->type_name("FILE");
   verify->add_option("FILE", given.file, "The container")->required();
-  verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file); });
+  verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
 
   CLI::App* show = addCommand(app, "show", "Print a storebag as JSON, without verifying it");
   show->add_option("FILE", given.file, "A container or an unsigned storebag")->required();

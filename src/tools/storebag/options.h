@@ -11,9 +11,10 @@
 namespace veltrad::storebag {
 
 struct Arguments {
-  std::string directory, key, file;
+  std::string directory, key, ed25519, file;
   int bits = config::SigningKey::kFewestBits;
   bool json = false;
+  bool ed25519Key = false;
   SignRequest sign;
   LintRequest lint;
   FormatRequest format;

@@ -222,7 +222,7 @@ void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& na
             fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", key.name, quoted(name),
                         isThreshold ? "this threshold is never used"
                                     : "here case does not matter, in \"country\" it does"),
-            fmt::format("Write {}.", quoted(capital)));
+            fmt::format("Write {}.", quoted(std::as_const(capital))));
 }
 
 void ValueCheck::checkAddress(const Spot& at, const Key& key, const std::string& address) const {
