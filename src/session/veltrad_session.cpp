@@ -246,6 +246,7 @@ bool VeltradSession::hasBackends(Message& message, Origin origin) {
 
 std::nullopt_t VeltradSession::refused(Message message, wire::Reason why) {
   _services.counters.count(why);
+  static_cast<void>(_word.restrict(message.payload));
   _fates.refused(familyFacts(), std::move(message), Origin::client, why);
   return std::nullopt;
 }
@@ -320,6 +321,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   Message message{std::move(payload), {}, category, type, 0};
   const auto refuse = [&](wire::Reason why) {
     _services.counters.count(why);
+    hearOwner();
+    static_cast<void>(_word.restrict(message.payload));
     fates.refused(familyFacts(), std::move(message), Origin::oneShot, why);
   };
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||

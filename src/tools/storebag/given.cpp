@@ -157,6 +157,12 @@ constexpr GivenKey kKeys[] = {
      }},
 };
 
+// False for a message that reached no back end for want of category or type, or whose contents are lost.
+bool isWhole(const Dictionary& line) {
+  return line.contains(wire::kVeltraMessageParametersCategory) &&
+         line.contains(wire::kVeltraMessageParametersType) && !line.contains("contentsLost");
+}
+
 }  // namespace
 
 void Given::setUserInfo(std::string key, Value value) {
@@ -207,7 +213,9 @@ Result<std::vector<GivenMessage>, std::string> messagesIn(std::string_view lines
     const Dictionary* object = value.value().asDictionary();
     const std::string* event = object ? object->string("event") : nullptr;
     const std::string* operation = object ? object->string("op") : nullptr;
-    if (!(event && *event == "message") && !(operation && *operation == "send")) continue;
+    const bool isMessage = event && *event == "message";
+    if (!isMessage && !(operation && *operation == "send")) continue;
+    if (isMessage && !isWhole(*object)) continue;
     auto message = messageOf(value.value());
     if (!message) return Failure{fmt::format("{}:1: {}", number, message.error())};
     messages.push_back(std::move(message).value());
