@@ -91,6 +91,10 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Lower-case hexadecimal SHA-256 of the text's UTF-8 bytes, 64 characters.
   static std::string convertIntoSHA256(std::string_view text);
 
+  // Goes on where the one of the same name stopped that the session had before: its event number, and what
+  // waits in its batch. Called before the first message and before other threads know the back end; the other
+  // sends nothing from then on.
+  virtual void takeOver(VeltraBackend& before) { _eventID = before._eventID; }
   // Called before the session releases the back end.
   virtual void cleanup() {}
   virtual void updateState();
