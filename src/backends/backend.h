@@ -171,6 +171,8 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual ClientMatch clientMatch() const { return {}; }
   // What the record is to say of a step of the message, with how the back end stands. The session's thread.
   wire::StepEntry stepOf(const NumberedMessage& message);
+  // The same for a file or log data.
+  wire::StepEntry stepOf(const MessageNote& note);
   // Writes down a decision after which nothing more becomes of the message here.
   Sent settled(const NumberedMessage& message, wire::Decision decision);
 

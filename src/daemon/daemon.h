@@ -36,7 +36,7 @@ class Daemon {
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
-  const platform::FateRing& fates() const { return _fates; }
+  platform::FateRing& fates() { return _fates; }
 
  private:
   Services& _services;

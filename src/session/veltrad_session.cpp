@@ -250,6 +250,7 @@ bool VeltradSession::hasBackends(Message& message, Origin origin) {
 
 std::nullopt_t VeltradSession::refused(Message message, wire::Reason why) {
   _services.counters.count(why);
+  static_cast<void>(_word.restrict(message.payload));
   _fates.refused(familyFacts(), std::move(message), Origin::client,
                  _sessionDelegate.reasonBehind(*this, why));
   return std::nullopt;
@@ -325,6 +326,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   Message message{std::move(payload), {}, category, type, 0};
   const auto refuse = [&](wire::Reason why) {
     _services.counters.count(why);
+    hearOwner();
+    static_cast<void>(_word.restrict(message.payload));
     fates.refused(familyFacts(), std::move(message), Origin::oneShot,
                   _sessionDelegate.reasonBehind(*this, why));
   };

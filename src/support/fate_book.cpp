@@ -64,7 +64,7 @@ void takeStep(BackendFate& fate, const ToldStep& step) {
   takeNames(fate, step);
   if (step.standing) {
     fate.standing = step.standing;
-    fate.eventNumber = entry.eventNumber;
+    if ((step.message & wire::kNoMessage) == 0) fate.eventNumber = entry.eventNumber;
   }
   if (entry.batch != 0) fate.batch = entry.batch;
   if (entry.post != 0) fate.post = entry.post;

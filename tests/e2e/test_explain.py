@@ -357,11 +357,13 @@ class ExplainedAndCompared(unittest.TestCase):
             done = subprocess.run([program("veltra-storebag"), "diff", "--json", self.path / "old.json", self.path / "new.json"],
                                   capture_output=True, text=True)
             changes = json.loads(done.stdout)["changes"]
+            # When a batch is flushed decides what a back end that holds its events drops.
+            said = done.returncode == 1 or any(change["kind"] == "batching" for change in changes)
             for session in world.sessions:
                 draws = {name: world.dice.random() for name in HTTPS}
                 was, now = (self.leaving(explain(self.path, world, session, draws, bag)) for bag in ("old.json", "new.json"))
                 more += bool(now - was)
-                self.assertFalse(now - was and done.returncode == 0, (SEED, world.number, session, now - was, changes, *bags))
+                self.assertTrue(said or not now - was, (SEED, world.number, session, now - was, changes, *bags))
             tried += 1
         print(f"{tried} changes, {more} sessions in which more leaves", flush=True)
         self.assertGreater(more, tried / 10)

@@ -58,10 +58,17 @@ void addFates(CLI::App& app, Options& options) {
       addCommand(app, options, Command::watch, "watch", "Tell the same as it happens, until interrupted")
           ->group(kCare);
   addFilters(*watch, options.care.fates);
+  watch->add_flag("--contents", options.care.contents,
+                  "Also what the messages hold, which needs \"control\"");
   watch->footer(
       "One line for each message and each of its steps. What was overwritten before it could be read is "
       "counted\n"
-      "and said.\n\nExample:\n  veltractl watch --client lamp --json");
+      "and said. With --contents, payload and user info follow, without what policy.json removes and with "
+      "the\n"
+      "digests of what it hashes.\n\n"
+      "Examples:\n  veltractl watch --client lamp --json\n"
+      "  veltractl watch --json --contents >messages.jsonl   # for veltra-storebag explain and diff "
+      "--messages");
 }
 
 }  // namespace veltrad::ctl

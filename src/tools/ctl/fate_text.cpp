@@ -61,6 +61,8 @@ std::string wordsOf(const support::ToldStep& step) {
       return step.text ? "sent to " + shown(step.text) : "sent";
     case Step::again:
       return "sent again";
+    case Step::acknowledged:
+      return "acknowledged" + (reason == wire::Reason::acknowledged_by_number ? why(reason) : "");
     case Step::given_up:
       return "given up" + why(reason);
     case Step::dropped:

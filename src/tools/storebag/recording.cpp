@@ -16,11 +16,11 @@
 namespace veltrad::storebag {
 namespace {
 
-// Whether a line of a recording is a message that reached the back ends.
+// Whether a line of a recording is a message that reached the back ends, with what it held.
 bool isWatched(const Dictionary& line) {
   const std::string* event = line.string("event");
   return event && *event == "message" && line.contains(wire::kVeltraMessageParametersCategory) &&
-         line.contains(wire::kVeltraMessageParametersType);
+         line.contains(wire::kVeltraMessageParametersType) && !line.contains("contentsLost");
 }
 
 Dictionary sessionOf(const Dictionary& line) {
