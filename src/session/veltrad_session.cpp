@@ -248,11 +248,12 @@ bool VeltradSession::hasBackends(Message& message, Origin origin) {
   return false;
 }
 
-std::nullopt_t VeltradSession::refused(Message message, wire::Reason why) {
+std::nullopt_t VeltradSession::refused(Message message, wire::Reason why, SessionFates* oneShot) {
   _services.counters.count(why);
   static_cast<void>(_word.restrict(message.payload));
-  _fates.refused(familyFacts(), std::move(message), Origin::client,
-                 _sessionDelegate.reasonBehind(*this, why));
+  (oneShot ? *oneShot : _fates)
+      .refused(familyFacts(), std::move(message), oneShot ? Origin::oneShot : Origin::client,
+               _sessionDelegate.reasonBehind(*this, why));
   return std::nullopt;
 }
 
@@ -325,11 +326,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   SessionFates fates(_services.fates);
   Message message{std::move(payload), {}, category, type, 0};
   const auto refuse = [&](wire::Reason why) {
-    _services.counters.count(why);
     hearOwner();
-    static_cast<void>(_word.restrict(message.payload));
-    fates.refused(familyFacts(), std::move(message), Origin::oneShot,
-                  _sessionDelegate.reasonBehind(*this, why));
+    static_cast<void>(refused(std::move(message), why, &fates));
   };
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
@@ -339,9 +337,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
   backends::SharedDictionary kept;
   backends::SharedDictionary identity;
-  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
+  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity))
     return refuse(wire::Reason::message_over_share);
-  }
   _sessionInfo = kept;
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);

@@ -114,7 +114,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // The record of fates, which knows what the session is.
   SessionFates& fates();
   // Counts and records why the client's message reaches no back end. Returns nothing.
-  std::nullopt_t refused(Message message, wire::Reason why);
+  // `oneShot`: the record of a message without a session; null for one of the session.
+  std::nullopt_t refused(Message message, wire::Reason why, SessionFates* oneShot = nullptr);
   void sayWithoutUserInfo();
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
 
