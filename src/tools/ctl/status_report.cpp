@@ -79,7 +79,7 @@ void addDaemon(std::string& out, const Dictionary& daemon) {
     out += fmt::format("\n  {:<13} {:.0f} of {:.0f}{} ({:.0f} %)", name, used / unit, most / unit,
                        unit > 1 ? " MiB" : "", most > 0 ? 100 * used / most : 0);
   }
-  if (daemon.string("clock")) out += "\n  the clock is " + text(daemon, "clock", "");
+  if (daemon.string("clock")) out += "\n  the clock is " + textIn(daemon, "clock", "");
 }
 
 void addStorebags(std::string& out, const Array& storebags, double now) {
@@ -100,7 +100,7 @@ void addStorebags(std::string& out, const Array& storebags, double now) {
         textIn(*storebag, "state", "") == "successful" ? "fetched" : "fetch failed", formatDuration(*age),
         wait > 0 ? "not before " + formatDuration(wait) + " from now" : "with the next session");
     if (storebag->string("refusal"))
-      out += "\n    the last one was refused: " + text(*storebag, "refusal", "");
+      out += "\n    the last one was refused: " + textIn(*storebag, "refusal", "");
   }
   if (never > 0) out += fmt::format("\n  {} others: no session has asked for them", never);
 }
