@@ -129,6 +129,7 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   facts.device.udid = _deviceid;
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
+  facts.connection = backends::connectionNumber(_sessionIDString);
   auto made = createBackends(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
        _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo)},

@@ -129,6 +129,20 @@ void addServers(std::string& out, const Array& servers, double now) {
   }
 }
 
+void addSpool(std::string& out, const Dictionary& spool, double now) {
+  const auto oldest = real(spool, "oldest");
+  out += fmt::format("\n\nSpool\n  {} posts, {} bytes{}", number(spool, "posts"), number(spool, "bytes"),
+                     oldest ? ", the oldest " + formatDuration(now - *oldest) + " old" : "");
+  for (const Value& one : array(spool, "addresses")) {
+    const Dictionary* address = one.asDictionary();
+    if (!address) continue;
+    const double wait = real(*address, "nextTry").value_or(now) - now;
+    out += fmt::format("\n  {}: {} posts, last error: {}, next try {}", text(*address, "address", ""),
+                       number(*address, "posts"), text(*address, "lastError", "none"),
+                       wait > 0 ? "in " + formatDuration(wait) : "now");
+  }
+}
+
 }  // namespace
 
 Array treeOfSessions(Array listed) {
@@ -168,6 +182,7 @@ std::string formatStatus(const Dictionary& status, double now) {
   }
   addStorebags(out, array(status, "storebags"), now);
   addServers(out, array(status, "servers"), now);
+  if (const Dictionary* spool = status.dictionary("spool")) addSpool(out, *spool, now);
   return out;
 }
 
