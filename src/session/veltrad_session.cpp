@@ -137,6 +137,7 @@ void VeltradSession::createBackends(const BackendSet* before) {
   facts.device.udid = _deviceid;
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
+  facts.connection = backends::connectionNumber(_sessionIDString);
   const config::StorebagSection& storebag = _storebag.section();
   auto made = session::createBackends(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
