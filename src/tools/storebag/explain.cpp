@@ -199,6 +199,9 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
     config::EditedFields edits;
     if (word->fields) word->fields->apply(payload, edits);
     addEdits(edits, told);
+    // Only the device knows its digests.
+    for (const std::string& key : edits.hashed)
+      if (payload.contains(key)) payload.set(key, "null");
     char field[backends::PacketText::kSize];
     backends::PacketText(field).append(payload);
     told.texts.emplace_back(field);
