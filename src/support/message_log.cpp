@@ -27,8 +27,8 @@ namespace veltrad::support {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
-constexpr std::size_t kLineBytes = 128;  // the memory of a waiting line besides its text
-constexpr std::size_t kMostAtOnce = 64;  // lines in one call
+constexpr std::size_t kLineBytes = 128;       // the memory of a waiting line besides its text
+constexpr std::size_t kMostLinesAtOnce = 64;  // lines in one call
 constexpr std::string_view kPrefix = "veltrad_";
 constexpr std::string_view kSuffix = "_messageLog.diag";
 
@@ -153,7 +153,7 @@ void MessageLog::end(const std::vector<std::string>& lines) {
 void MessageLog::writeWaiting() {
   const std::vector<std::string> lines = takeWaiting();
   for (std::span<const std::string> left = lines; !left.empty();) {
-    const auto some = left.first(std::min(left.size(), kMostAtOnce));
+    const auto some = left.first(std::min(left.size(), kMostLinesAtOnce));
     if (!append(some)) _counters.count(wire::Reason::log_line_disk, some.size());
     left = left.subspan(some.size());
   }
@@ -167,7 +167,7 @@ bool MessageLog::append(std::span<const std::string> lines) {
   // Neither follows a link nor blocks.
   const FileDescriptor opened(
       open(file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  iovec pieces[kMostAtOnce];
+  iovec pieces[kMostLinesAtOnce];
   std::size_t bytes = 0;
   for (std::size_t i = 0; i < lines.size(); ++i) {
     pieces[i] = {const_cast<char*>(lines[i].data()), lines[i].size()};

@@ -33,7 +33,7 @@ std::string lineOfPost(const Dictionary& post, double now) {
       std::isfinite(next) && next > now ? "in " + formatDuration(next - now) : "at its turn");
 }
 
-int list(ControlClient& daemon, const Options& options) {
+int listSpool(ControlClient& daemon, const Options& options) {
   std::size_t count = 0;
   Dictionary arguments;
   for (;;) {
@@ -73,7 +73,8 @@ int change(ControlClient& daemon, const Options& options) {
 int runSpool(const Options& options) {
   auto daemon = ControlClient::connect(options.root);
   if (!daemon) return refused(daemon.error());
-  return options.command == Command::spool ? list(daemon.value(), options) : change(daemon.value(), options);
+  return options.command == Command::spool ? listSpool(daemon.value(), options)
+                                           : change(daemon.value(), options);
 }
 
 }  // namespace veltrad::ctl
