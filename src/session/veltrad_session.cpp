@@ -138,11 +138,10 @@ void VeltradSession::createBackends(const BackendSet* before) {
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
   facts.connection = backends::connectionNumber(_sessionIDString);
-  const config::StorebagSection& storebag = _storebag.section();
   auto made = session::createBackends(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo), before},
-      &storebag, _sessionInfo.get(), std::move(facts));
+       _word.now(), _account, false, _fates.comesFrom(_storebag.section().origin, _sessionInfo), before},
+      &_storebag.section(), _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   cleanUp(made.get());  // those that were replaced
 }
