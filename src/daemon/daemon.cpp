@@ -69,7 +69,8 @@ void Daemon::startSpool() {
     return;
   }
   // What the settings say is not known while they cannot be read.
-  if (!_choices.current()) return;
+  const auto choices = _choices.current();
+  if (!choices || choices->spool) return;
   const support::SpoolFolder folder(_services.files, _services.root.spoolDirectory());
   const auto removed = folder.removeAll();
   _services.counters.eventTaken(removed.events);

@@ -229,16 +229,17 @@ bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& lis
   std::size_t stuck = listener.invalidate(deadline - 1s);
   stuck += control.invalidate(deadline - 1s);
   services.http.drain(deadline - (daemon.spool() ? kTimeToKeep : 500ms));
+  daemon.stopSpool();  // removes what was answered meanwhile
   services.pool.drain(deadline - 300ms);
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
-  if (daemon.spool()) daemon.spool()->drain(deadline - 300ms);
+  const bool kept = !daemon.spool() || daemon.spool()->drain(deadline - 300ms);
   services.history.writeNow(deadline - 250ms);
   if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
   if (services.destinations.version() > 0) files.destinations.writeLast(deadline - 150ms);
   const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
-  if (!written) logWarning("main: the disk did not take everything within the time of a stop");
-  return stuck == 0 && written;
+  if (!kept || !written) logWarning("main: the disk did not take everything within the time of a stop");
+  return stuck == 0 && kept && written;
 }
 
 // Prints what one of the two known arguments asks for. False: there is none, and others are not read.
@@ -308,7 +309,11 @@ int main(int count, char** arguments) {
   platform::StateFile metricsFile(metricsState(observers), services.files, services.writer,
                                   services.root.metricsPath());
   daemon.startSpool();
-  if (!listener.resume() || !control.resume()) return 1;
+  if (!listener.resume() || !control.resume()) {
+    daemon.stopSpool();
+    services.http.drain(std::chrono::steady_clock::now());
+    return 1;
+  }
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");

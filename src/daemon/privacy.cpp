@@ -199,13 +199,14 @@ Privacy::Answer Privacy::resetIdentifiers() {
   _services.gate.identifiersReset();
   _graceRuns = obey() || _graceRuns;
   // What waits bears the identifiers before. Sessions take the new ones at their next call.
+  std::size_t posts = emptySpool(wire::Reason::refused_by_owner);
   static_cast<void>(_services.http.refuseWaiting(true, kHTTPPatience));
   _agent.dropIdentified();
   _factory.dropWaiting([](const std::string&) { return true; });
-  emptySpool(wire::Reason::refused_by_owner);
+  posts += emptySpool(wire::Reason::refused_by_owner);
   auto known = identifiers();
   if (!known) return Failure{known.error()};
-  return Dictionary{{"identifiers", std::move(known.value())}};
+  return Dictionary{{"identifiers", std::move(known.value())}, {"dropped", Dictionary{{"posts", posts}}}};
 }
 
 }  // namespace veltrad::daemon

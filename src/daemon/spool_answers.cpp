@@ -2,6 +2,7 @@
 // Asks the spool, and its files for what only they know.
 #include "daemon/spool_answers.h"
 
+#include <algorithm>
 #include <chrono>
 #include <cstdint>
 #include <limits>
@@ -123,7 +124,8 @@ Result<Dictionary, std::string> dropFromSpool(PostSpool* spool, const Dictionary
     if (!name)
       return Failure{"There is no post \"" + escapedForLog(one.toText().value_or("")) +
                      "\" in the spool: see veltractl spool."};
-    names.push_back(*name);
+    const auto same = [&](const PostSpool::Name& other) { return other.order == name->order; };
+    if (std::none_of(names.begin(), names.end(), same)) names.push_back(*name);
   }
   if (names.empty()) return Failure{std::string("argument \"ids\" must name posts")};
   for (const PostSpool::Name& name : names) spool->drop(name, wire::Reason::by_hand);

@@ -54,7 +54,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::sectionFor(std::in
   const char* name = config::storebagNameForClientType(clientType);
   const Lock held(_lock);
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
-  return at == _cachedStorebags.end() ? nullptr : at->second.data;
+  return at == _cachedStorebags.end() ? nullptr : used(at->second);
 }
 
 config::StorebagAnswer StorebagCache::refresh(std::int32_t clientType) {

@@ -335,11 +335,11 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
     return refuse(wire::Reason::no_identifiers);  // without a reply, which ends the client's call
   }
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
-  backends::SharedDictionary kept;
-  backends::SharedDictionary identity;
+  backends::SharedDictionary kept, identity;
   if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity))
     return refuse(wire::Reason::message_over_share);
   _sessionInfo = kept;
+  hearOwner();
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
   const auto storebag = _sessionDelegate.storebagForSession(*this);

@@ -15,6 +15,7 @@
 #include <chrono>
 #include <cmath>
 #include <cstring>
+#include <new>
 #include <vector>
 
 #include "base/file_descriptor.h"
@@ -124,8 +125,8 @@ void MessageLog::put(std::string_view format, std::initializer_list<std::string_
     const Lock held(_mutex);
     if (_bytes > 0 && (bytes > kMostBytes || _bytes > kMostBytes - bytes))
       return _counters.count(wire::Reason::log_line_queue_full);
-    _bytes += bytes;
     _waiting.push_back(std::move(line));
+    _bytes += bytes;
     if (_waiting.size() > 1) return;
   }
   using Put = platform::DiskWriter::Queue::Put;
@@ -154,7 +155,12 @@ void MessageLog::writeWaiting() {
   const std::vector<std::string> lines = takeWaiting();
   for (std::span<const std::string> left = lines; !left.empty();) {
     const auto some = left.first(std::min(left.size(), kMostLinesAtOnce));
-    if (!append(some)) _counters.count(wire::Reason::log_line_disk, some.size());
+    bool written = false;
+    try {
+      written = append(some);
+    } catch (const std::bad_alloc&) {
+    }
+    if (!written) _counters.count(wire::Reason::log_line_disk, some.size());
     left = left.subspan(some.size());
   }
   end(lines);

@@ -61,6 +61,9 @@ std::vector<SpoolFolder::Name> SpoolFolder::names() const {
 
 Result<Done, std::string> SpoolFolder::write(const Name& name, std::string_view file) const {
   auto written = _files.replace(pathOf(name), file, 0600);
+  // The directory may have gone, or could not be made before.
+  if (!written && written.error().kind == platform::FileFailure::Kind::notFound && make())
+    written = _files.replace(pathOf(name), file, 0600);
   if (written) return Done();
   // The file may be there, and its name not on disk.
   remove(name);

@@ -133,11 +133,16 @@ TEST(SpoolWait, HeedsWhatTheServerAsksForAndWakesSooner) {
   EXPECT_DOUBLE_EQ(wait.next(), tried + 0.9 * 900);
   wait.woken(tried + 100, 0.5);
   EXPECT_DOUBLE_EQ(wait.next(), tried + 115);
+  wait.woken(tried + 101, 0.1);  // routes that come and go do not hurry it
+  EXPECT_DOUBLE_EQ(wait.next(), tried + 115);
   wait.failed(tried + 115, true, 0, 0.5, "a");
   EXPECT_DOUBLE_EQ(wait.next(), tried + 145);  // doubles from the first wait again
   wait.succeeded();
   wait.left(1200);
   EXPECT_EQ(wait.next(), 1200.25);
+  wait.failed(1300, false, 20, 0.5, "HTTP 429");
+  wait.succeeded();  // of a post that had begun before
+  EXPECT_TRUE(wait.refuses(1319) && !wait.refuses(1320));
 }
 
 }  // namespace

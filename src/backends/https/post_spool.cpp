@@ -2,6 +2,8 @@
 // Files, reads and drops posts.
 #include "backends/https/post_spool.h"
 
+#include <new>
+
 #include "backends/https/post_request.h"
 #include "backends/https/spool_verdicts.h"
 #include "config/owner_gate.h"
@@ -73,7 +75,8 @@ std::optional<std::string> PostSpool::admit(SpooledPost& post) {
 void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result) {
   support::SpoolEntry& entry = post->entry;
   const std::string address = http::addressOf(entry.url);
-  if (result || result.error().begun) ++entry.tries;
+  // One that the day's limit refused has begun, but not left.
+  if (result || (result.error().begun && result.error().refusal != Reason::over_daily_limit)) ++entry.tries;
   if (isToBeKept(result)) {
     entry.lastError = outcomeOf(result);
     _queue.failed(address, result);
@@ -97,8 +100,14 @@ void PostSpool::file(const std::shared_ptr<SpooledPost>& post) {
   }
   using Put = platform::DiskWriter::Queue::Put;
   const std::size_t bytes = entry.body.size() + entry.url.size();
-  if (_jobs.put([this, post] { write(*post); }, bytes) != Put::taken)
-    drop({entry.order, entry.id}, Reason::spool_disk, &entry);
+  const auto job = [this, post] {
+    try {
+      write(*post);
+    } catch (const std::bad_alloc&) {
+      drop({post->entry.order, post->entry.id}, Reason::spool_disk, &post->entry);
+    }
+  };
+  if (_jobs.put(job, bytes) != Put::taken) drop({entry.order, entry.id}, Reason::spool_disk, &entry);
 }
 
 // On the disk writer's thread.

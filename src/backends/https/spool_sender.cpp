@@ -117,6 +117,7 @@ void SpoolSender::send(const PostSpool::Name& name) {
   if (!place) return;
   read->tries = place->tries;
   if (const auto refused = _spool.refusalBeforeTry(*read)) return _spool.drop(name, *refused, &*read);
+  if (!_spool.queue().holds(name.order)) return;  // it was dropped while a storebag was fetched
   const auto post = std::make_shared<const support::SpoolEntry>(std::move(*read));
   _spool.begins(name);
   const auto ended = [this, post](const http::HTTPResult& result) {

@@ -26,8 +26,7 @@ void SpoolWait::failed(double now, bool wasTry, double retryAfter, double draw, 
 }
 
 void SpoolWait::succeeded() {
-  emptied();
-  _retryUntil = 0;
+  emptied();  // a "Retry-After" stands: the post may have begun before it came
 }
 
 void SpoolWait::emptied() {
@@ -43,7 +42,8 @@ void SpoolWait::left(double now) {
 void SpoolWait::woken(double now, double draw) {
   if (!_failing) return;
   _wait = _pace->firstWait;
-  _nextTry = std::min(_nextTry, now + draw * _wait);
+  // Routes that come and go do not bring the next try nearer than that.
+  if (_nextTry > now + _wait) _nextTry = now + draw * _wait;
 }
 
 void SpoolWait::hurried() {
