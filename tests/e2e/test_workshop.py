@@ -95,7 +95,11 @@ class Workshop(unittest.TestCase):
         self.assertEqual(json.loads(text), [{
             "file": str(wrong), "line": 2, "column": 23, "severity": "error", "name": "unknown-key",
             "path": "release.mivo.aktive", "message": 'unknown key "aktive": did you mean "active"?', "mend": 'Write "active".'}])
-        self.assertEqual(run("lint", self.path / "nowhere")[0], 1)
+        nowhere = self.path / "nowhere"
+        status, found, error = run("lint", "--json", nowhere, wrong, self.path)
+        self.assertEqual((status, json.loads(found)), (1, json.loads(text)))
+        self.assertRegex(error, rf"^veltra-storebag: .*{nowhere}.*\nveltra-storebag: .*{self.path}.*\n$")
+        self.assertEqual(run("lint", nowhere, good), (1, "", error.splitlines(keepends=True)[0]))
         self.assertEqual(run("lint", "--lab", SOURCE / "examples/storebag.json")[0], 0)
         self.assertEqual(run("lint", SOURCE / "examples/storebag.json")[0], 1)
 
@@ -191,10 +195,10 @@ class Workshop(unittest.TestCase):
     def test_differences(self):
         text = (SOURCE / "tests/tools/storebag/diffs.json").read_text()
         prepared = json.loads(re.sub("^//.*", "", text, flags=re.MULTILINE))
-        old = self.file("old", prepared["storebag"])
         for pair in prepared["pairs"]:
             with self.subTest(edit=pair["edit"]):
-                new = self.file("new", self.edited(prepared["storebag"], pair["edit"]))
+                before = self.edited(prepared["storebag"], pair.get("given", {}))
+                old, new = self.file("old", before), self.file("new", self.edited(before, pair["edit"]))
                 status, text, error = run("diff", "--json", old, new)
                 told = [[change[key] for key in ("effect", "kind", "section", "backend", "client", "key", "text")]
                         for change in json.loads(text)["changes"]]
@@ -202,6 +206,16 @@ class Workshop(unittest.TestCase):
                 self.assertEqual(status, int(any(row[0] == "more" for row in pair["expect"])))
                 text = run("diff", old, new)[1]
                 self.assertEqual([row[6] for row in pair["expect"] if row[6] not in text], [])
+
+    def test_differences_in_a_long_list(self):
+        entries = [{**ENTRY, "service": f"s{n}."} for n in range(50)]
+        old, new = (self.file(name, {"release": {"httppost": {"clients": clients}}})
+                    for name, clients in (("old", entries), ("new", entries[::-1])))
+        status, text, _ = run("diff", "--json", old, new)
+        changes = json.loads(text)["changes"]
+        self.assertEqual((status, [one["text"] for one in changes if one["effect"] != "other"]), (1, [
+            'texts in "service" have other places: of names that hold two of them, only 1000 pairs were compared, and more may leave']))
+        self.assertEqual(run("diff", old, old)[0], 0)
 
     def test_differences_of_messages(self):
         lines = [{"event": "message", "message": 4, "from": "client", "clientType": 7, "client": "phone", "category": 5, "type": 1,

@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <iterator>
 
 #include "backends/https/text_lists.h"
 #include "storebag/words.h"
@@ -18,6 +19,8 @@ using Number = std::optional<std::size_t>;
 // The name of a client or service that no entry names.
 const std::string kAnyOther = "\x7F";
 constexpr std::size_t kMostShown = 4;
+// Only texts that have changed places make such pairs.
+constexpr std::size_t kMostPairs = 1000;
 
 // As the daemon reads them: what is no dictionary is passed over.
 std::vector<WrittenEntry> entriesIn(const Array& clients) {
@@ -35,21 +38,52 @@ Number entryFor(const std::vector<WrittenEntry>& entries, const std::string& cli
   return at == entries.end() ? std::nullopt : Number(at - entries.begin());
 }
 
-Number entryWithAddress(const std::vector<WrittenEntry>& entries) {
-  const auto at = std::find_if(entries.begin(), entries.end(),
-                               [](const WrittenEntry& one) { return one.entry.postURL.has_value(); });
-  return at == entries.end() ? std::nullopt : Number(at - entries.begin());
+// The first of both; nothing comes last.
+Number firstOf(const Number& a, const Number& b) {
+  return a && b ? std::min(a, b) : a ? a : b;
 }
 
-// Whether any event of a client that requires user info can leave.
+// What holds for sessions that require no user info.
+struct Addresses {
+  // The entry that was taken.
+  Number number;
+  std::optional<std::string> post, realtime;
+  bool extras = false;
+};
+
+// The first entry with "post_url" is taken; if none has it, the last one still gives "realtime_post_url".
+Addresses addressesIn(const std::vector<WrittenEntry>& entries) {
+  Addresses taken;
+  for (std::size_t i = 0; i < entries.size() && !taken.post; ++i) {
+    const ClientEntry& entry = entries[i].entry;
+    taken = {i, entry.postURL, entry.realtimePostURL ? entry.realtimePostURL : entry.postURL,
+             entry.postURL && entry.extrasOnInternal != 0};
+  }
+  return taken;
+}
+
+// Whether any event of a client that requires user info can leave. A back end that is held by sampling
+// reports after a message that overrides it, and with a hierarchy a parent session decides.
 bool letsOut(const ClientEntry& entry) {
+  const bool held = entry.overrideSampling.value_or(1) > 0;
+  const auto reports = [held](const std::optional<double>& threshold) {
+    return threshold && (*threshold > 0 || held);
+  };
   const auto& countries = entry.perCountrySamplingThresholds;
-  const bool somewhere =
-      countries && std::any_of(countries->begin(), countries->end(), [](const config::CountryThreshold& row) {
-        return row.threshold.value_or(0) > 0;
-      });
-  return entry.filters && !entry.localeWhitelist.texts.empty() && !recipientOf(entry.postURL).empty() &&
-         (entry.samplingThreshold.value_or(0) > 0 || somewhere);
+  const bool sampledIn =
+      reports(entry.samplingThreshold) ||
+      (countries && std::any_of(countries->begin(), countries->end(),
+                                [&](const config::CountryThreshold& row) { return reports(row.threshold); }));
+  const bool address = !recipientOf(entry.postURL).empty() || !recipientOf(entry.realtimePostURL).empty();
+  return entry.filters && !entry.localeWhitelist.texts.empty() && address &&
+         (sampledIn || entry.hierarchy != 0);
+}
+
+// "events go to a.example"
+std::string destinationText(const ClientEntry& entry) {
+  const std::string host = recipientOf(entry.postURL);
+  return host.empty() ? "realtime events go to " + recipientOf(entry.realtimePostURL)
+                      : "events go to " + host;
 }
 
 std::string clientText(const std::string& client, const std::string& service) {
@@ -78,6 +112,7 @@ void ClientsDiff::compare() {
   sayAdded();
   sayRemoved();
   sayOrder();
+  sayIncomplete();
 }
 
 void ClientsDiff::pairUp() {
@@ -139,6 +174,22 @@ void ClientsDiff::follow(const std::string& who, const Move& move, Effect effect
   if (!isNew && !isGone && before && now && _partnerOfOld[*before] != now) note(_moved[move], before);
 }
 
+// The name of a service may hold several of the texts, and gets the first of their entries. Two of them show
+// every combination of an old and a new entry.
+void ClientsDiff::addNamesWithTwoTexts(Moves& moves) {
+  Moves more;
+  for (auto a = moves.begin(); a != moves.end(); ++a) {
+    for (auto b = std::next(a); b != moves.end(); ++b) {
+      const Move both(firstOf(a->first.first, b->first.first), firstOf(a->first.second, b->first.second));
+      if (moves.contains(both)) continue;
+      if (++_pairs > kMostPairs) return moves.merge(more);
+      if (std::vector<std::string>& names = more[both]; names.empty())
+        names.push_back(a->second.front() + " and " + b->second.front());
+    }
+  }
+  moves.merge(more);
+}
+
 void ClientsDiff::followClients() {
   Names clients{kAnyOther}, services{kAnyOther};
   for (const auto* entries : {&_old, &_now}) {
@@ -149,9 +200,10 @@ void ClientsDiff::followClients() {
   }
   std::map<Move, Effect> effects;
   for (const std::string& client : clients) {
-    std::map<Move, std::vector<std::string>> moves;
+    Moves moves;
     for (const std::string& service : services)
       moves[{entryFor(_old, client, service), entryFor(_now, client, service)}].push_back(service);
+    addNamesWithTwoTexts(moves);
     for (const auto& [move, moving] : moves) {
       auto known = effects.find(move);
       if (known == effects.end()) known = effects.emplace(move, effectOf(move)).first;
@@ -164,14 +216,14 @@ void ClientsDiff::followClients() {
   }
 }
 
-// Of these the first entry with an address says where their events go, and nothing else.
+// Of these one entry says where their events go and whether they bear the device's identifier.
 void ClientsDiff::followSessionsWithoutUserInfo() {
-  const Move move(entryWithAddress(_old), entryWithAddress(_now));
-  const auto addressOf = [](const std::vector<WrittenEntry>& entries, const Number& number) {
-    return number ? entries[*number].entry.postURL : std::nullopt;
-  };
-  const auto before = addressOf(_old, move.first), now = addressOf(_now, move.second);
-  if (before != now) follow("sessions that require no user info", move, effectOfAddress(before, now));
+  const Addresses before = addressesIn(_old), now = addressesIn(_now);
+  if (before.post == now.post && before.realtime == now.realtime && before.extras == now.extras) return;
+  Effect effect =
+      std::min(effectOfAddress(before.post, now.post), effectOfAddress(before.realtime, now.realtime));
+  if (before.extras != now.extras) effect = std::min(effect, now.extras ? Effect::more : Effect::less);
+  follow("sessions that require no user info", {before.number, now.number}, effect);
 }
 
 std::string ClientsDiff::othersIn(const Moved& moved, const std::vector<WrittenEntry>& entries) {
@@ -189,7 +241,7 @@ void ClientsDiff::sayAdded() {
     std::string text = whoIn(entry.entry, i) + ": new entry";
     if (moved.who.empty()) text += ", which nobody gets";
     if (moved.others.contains(std::nullopt) && letsOut(entry.entry))
-      text += ": events go to " + recipientOf(entry.entry.postURL);
+      text += ": " + destinationText(entry.entry);
     if (const std::string others = othersIn(moved, _old); !others.empty())
       text += fmt::format("; it comes before that of {}", others);
     sinkAt(entry, i).say(ChangeKind::entry, moved.effect, std::nullopt, std::nullopt, Value(entry.asGiven),
@@ -205,7 +257,7 @@ void ClientsDiff::sayRemoved() {
     std::string text = whoIn(entry.entry, i) + ": the entry is gone";
     if (moved.who.empty()) text += ", which nobody got";
     if (moved.others.contains(std::nullopt) && letsOut(entry.entry))
-      text += fmt::format(": no more events go to {}", recipientOf(entry.entry.postURL));
+      text += ": no more " + destinationText(entry.entry);
     if (const std::string others = othersIn(moved, _now); !others.empty())
       text += fmt::format("; its place is taken by that of {}", others);
     sinkAt(entry, i).say(ChangeKind::entry, moved.effect, std::nullopt, Value(entry.asGiven), std::nullopt,
@@ -219,9 +271,8 @@ void ClientsDiff::sayOrder() {
     const auto& [before, now] = move;
     sinkAt(_now[*now], *now)
         .say(ChangeKind::order, moved.effect, std::nullopt, number(*before), number(*now),
-             fmt::format("{}: now the entry of {} comes first, before it was that of {}",
-                         shownNames(moved.who), whoIn(_now[*now].entry, *now),
-                         whoIn(_old[*before].entry, *before)));
+             fmt::format("{}: now the entry of {} applies, before it was that of {}", shownNames(moved.who),
+                         whoIn(_now[*now].entry, *now), whoIn(_old[*before].entry, *before)));
   }
   std::vector<std::size_t> order;
   for (const auto& partner : _partnerOfOld)
@@ -230,6 +281,16 @@ void ClientsDiff::sayOrder() {
   ChangeSink(_changes, _at)
       .say(ChangeKind::order, Effect::other, std::nullopt, std::nullopt, std::nullopt,
            "the entries stand in another order, and every client keeps its own");
+}
+
+void ClientsDiff::sayIncomplete() {
+  if (_pairs <= kMostPairs) return;
+  ChangeSink(_changes, _at)
+      .say(
+          ChangeKind::order, Effect::more, std::nullopt, std::nullopt, std::nullopt,
+          fmt::format("texts in \"service\" have other places: of names that hold two of them, only {} pairs "
+                      "were compared, and more may leave",
+                      kMostPairs));
 }
 
 }  // namespace veltrad::storebag

@@ -37,11 +37,15 @@ class ClientsDiff {
   void pairUp();
   void comparePairs();
   void follow(const std::string& who, const Move& move, Effect effect);
+  // Who gets another entry, by name or text of a service.
+  using Moves = std::map<Move, std::vector<std::string>>;
   void followClients();
+  void addNamesWithTwoTexts(Moves& moves);
   void followSessionsWithoutUserInfo();
   void sayAdded();
   void sayRemoved();
   void sayOrder();
+  void sayIncomplete();
   Effect effectOf(const Move& move) const;
   // The other entries, in words: "phone and lamp"; empty: there is none.
   static std::string othersIn(const Moved& moved, const std::vector<WrittenEntry>& entries);
@@ -59,6 +63,8 @@ class ClientsDiff {
   std::map<std::size_t, Moved> _added;
   std::map<std::size_t, Moved> _removed;
   std::map<Move, Moved> _moved;
+  // Pairs of texts that were compared; beyond the bound the result is incomplete.
+  std::size_t _pairs = 0;
 };
 
 }  // namespace veltrad::storebag

@@ -17,6 +17,8 @@ struct Outcome {
   bool done = false;
   std::string text;
   bool findings = false;
+  // What failed beside the output, one line each.
+  std::vector<std::string> failures = {};
 };
 
 // The files that keygen makes. The private key has mode 0600.
@@ -58,7 +60,8 @@ struct LintRequest {
   bool lab = false;
   bool json = false;
 };
-// Lists the findings in the storebags of such files, one per line, or says "nothing found".
+// Lists the findings in the storebags of such files, one per line, or says "nothing found". A file that
+// cannot be read is a failure beside the findings in the others.
 Outcome lint(const LintRequest& request);
 
 struct FormatRequest {

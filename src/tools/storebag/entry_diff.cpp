@@ -59,16 +59,25 @@ ListChange changeOf(const config::TextList& before, const config::TextList& now)
   return change;
 }
 
-// Of the devices in this country, the share that reports; nothing: the country is not listed. Consent,
-// devices and filters aside.
-std::optional<double> shareIn(const ClientEntry& entry, const std::string& country) {
+double shareOf(const std::optional<double>& threshold) {
+  return std::clamp(threshold.value_or(0), 0.0, 1.0);
+}
+
+// The share of devices that report a message that overrides sampling. Without a threshold none does.
+double overriddenShare(const ClientEntry& entry, const std::optional<double>& threshold) {
+  return threshold ? std::max(shareOf(threshold), shareOf(entry.overrideSampling.value_or(1))) : 0;
+}
+
+// The threshold of the devices in this country; false: the country is not listed. Consent, devices and
+// filters aside.
+bool findThreshold(const ClientEntry& entry, const std::string& country, std::optional<double>& threshold) {
   ClientEntry open = entry;
   open.deviceWhitelist = {};
   open.deviceBlacklist = {};
   open.filters.emplace();
   const auto verdict = backends::decideOnClient(open, {true, country, "", std::nullopt, 0});
-  if (!verdict.samplingReached) return std::nullopt;
-  return std::clamp(verdict.threshold.value_or(0), 0.0, 1.0);
+  threshold = verdict.threshold;
+  return verdict.samplingReached;
 }
 
 // The countries with thresholds of their own. The country of a locale has capital letters.
@@ -92,6 +101,12 @@ std::string sharesText(double before, double now) {
                               : before <= 0 ? "no device"
                                             : shareText(before) + " of devices";
   return fmt::format("reported by {}, now by {}", devices, shareText(now));
+}
+
+// "a message that overrides sampling is reported by none of the devices, now by all"
+std::string overriddenText(double before, double now) {
+  return fmt::format("a message that overrides sampling is reported by {} of the devices, now by {}",
+                     shareText(before), shareText(now));
 }
 
 std::string placesText(const std::vector<std::string>& countries) {
@@ -194,43 +209,72 @@ void EntryDiff::compareFilters() {
 
 void EntryDiff::compareSampling() {
   const std::set<std::string> old = countriesWithThreshold(_old), now = countriesWithThreshold(_now);
-  std::vector<std::string> own;
-  std::set_union(old.begin(), old.end(), now.begin(), now.end(), std::back_inserter(own));
-  const double before = std::clamp(_old.samplingThreshold.value_or(0), 0.0, 1.0);
-  const double after = std::clamp(_now.samplingThreshold.value_or(0), 0.0, 1.0);
-  if (before != after) {
+  const std::optional<SharesText> changed = changedShares(_old.samplingThreshold, _now.samplingThreshold);
+  if (changed) {
     std::vector<std::string> countries;
     for (const std::string& listedCountry : _now.localeWhitelist.texts)
       if (!old.contains(listedCountry) || !now.contains(listedCountry)) countries.push_back(listedCountry);
-    const bool counts = !countries.empty() || _now.localeWhitelist.texts.empty();
-    say(sampling, effectOf(counts && after > before, counts && after < before), "sampling_threshold",
-        fmt::format("{}: {}{}", _who, sharesText(before, after), placesText(countries)));
+    // A locale without a country passes every list.
+    const bool nowhereElse = countries.empty() && !_now.localeWhitelist.texts.empty();
+    say(sampling, changed->effect, "sampling_threshold",
+        fmt::format("{}: {}{}", _who, changed->text,
+                    nowhereElse ? ", where the locale has no country" : placesText(countries)));
   }
-  compareCountryThresholds(own);
+  compareCountryThresholds();
   compareHeld();
 }
 
-// Those of single countries, where they do not follow from the others.
-void EntryDiff::compareCountryThresholds(const std::vector<std::string>& countries) {
-  const std::set<std::string> old = countriesWithThreshold(_old), now = countriesWithThreshold(_now);
+// Whether more or fewer devices report with another threshold, if only messages that override sampling.
+std::optional<EntryDiff::SharesText> EntryDiff::changedShares(const std::optional<double>& old,
+                                                              const std::optional<double>& now) const {
+  const double before = shareOf(old), after = shareOf(now);
+  if (before != after)
+    return SharesText{effectOf(after > before, after < before), before, after, sharesText(before, after)};
+  if (old.has_value() == now.has_value()) return std::nullopt;
+  const double overridden = overriddenShare(_old, old), overriddenNow = overriddenShare(_now, now);
+  if (overridden == overriddenNow) return std::nullopt;
+  return SharesText{effectOf(overriddenNow > overridden, overriddenNow < overridden), before, after,
+                    overriddenText(overridden, overriddenNow)};
+}
+
+// Of the countries that have one before or now, and are listed before and now: old and new threshold.
+std::map<std::string, EntryDiff::Thresholds> EntryDiff::countryThresholds() const {
+  std::set<std::string> countries = countriesWithThreshold(_old);
+  countries.merge(countriesWithThreshold(_now));
+  std::map<std::string, Thresholds> all;
   for (const std::string& one : countries) {
-    const auto before = shareIn(_old, one), after = shareIn(_now, one);
-    if (!before || !after || *before == *after) continue;
-    _changes.say(sampling, effectOf(*after > *before, *after < *before), "per_country_sampling_thresholds",
-                 Value(*before), Value(*after),
-                 fmt::format("{}: {}, in {}", _who, sharesText(*before, *after), one));
+    Thresholds both;
+    if (findThreshold(_old, one, both.first) && findThreshold(_now, one, both.second)) all.emplace(one, both);
+  }
+  return all;
+}
+
+// Those of single countries, where they do not follow from the others.
+void EntryDiff::compareCountryThresholds() {
+  for (const auto& [one, thresholds] : countryThresholds()) {
+    const auto changed = changedShares(thresholds.first, thresholds.second);
+    if (changed)
+      _changes.say(sampling, changed->effect, "per_country_sampling_thresholds", Value(changed->before),
+                   Value(changed->now), fmt::format("{}: {}, in {}", _who, changed->text, one));
   }
 }
 
 // Events of devices that are sampled out leave if one of them overrides sampling.
 void EntryDiff::compareHeld() {
-  const double before = std::clamp(_old.overrideSampling.value_or(1), 0.0, 1.0);
-  const double now = std::clamp(_now.overrideSampling.value_or(1), 0.0, 1.0);
+  const double before = shareOf(_old.overrideSampling.value_or(1));
+  const double now = shareOf(_now.overrideSampling.value_or(1));
   if (before == now) return;
-  const bool counts = _old.samplingThreshold.value_or(0) < 1 || _now.samplingThreshold.value_or(0) < 1;
-  say(sampling, effectOf(counts && now > before, counts && now < before), "override_sampling",
-      fmt::format("{}: a message that overrides sampling is reported by {} of the devices, now by {}", _who,
-                  shareText(before), shareText(now)));
+  bool more = false, less = false;
+  const auto compareWhere = [&](const Thresholds& thresholds) {
+    const double old = overriddenShare(_old, thresholds.first);
+    const double current = overriddenShare(_now, thresholds.second);
+    more = more || (now > before && current > old);
+    less = less || (now < before && current < old);
+  };
+  compareWhere({_old.samplingThreshold, _now.samplingThreshold});
+  for (const auto& [one, thresholds] : countryThresholds()) compareWhere(thresholds);
+  say(sampling, effectOf(more, less), "override_sampling",
+      fmt::format("{}: {}", _who, overriddenText(before, now)));
 }
 
 void EntryDiff::compareIdentifiers() {
@@ -245,8 +289,10 @@ void EntryDiff::compareIdentifiers() {
                     ? ": events now bear an identifier of the client alone, not that of the installation"
                     : ": events now bear the identifier that all clients of the installation share"));
   if (_old.hierarchy != _now.hierarchy)
-    say(hierarchy, Effect::other, "hierarchy",
-        fmt::format("{}: level {} of its family, now {}", _who, _old.hierarchy, _now.hierarchy));
+    say(hierarchy, Effect::more, "hierarchy",
+        fmt::format("{}: level {} of its family, now {}: {}", _who, _old.hierarchy, _now.hierarchy,
+                    _now.hierarchy != 0 ? "its parent session decides whether it reports"
+                                        : "no parent session decides any more whether it reports"));
 }
 
 void EntryDiff::compareAddresses() {

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstddef>
+#include <map>
 #include <optional>
 #include <string>
 #include <utility>
@@ -44,13 +45,26 @@ class EntryDiff {
   void compare();
 
  private:
+  // Before and now.
+  using Thresholds = std::pair<std::optional<double>, std::optional<double>>;
+  // The shares of devices that report, 0 to 1, and what their change means.
+  struct SharesText {
+    Effect effect;
+    double before;
+    double now;
+    std::string text;
+  };
+
   void say(ChangeKind kind, Effect effect, const char* key, std::string text);
   void compareConsent();
   void compareCountries();
   void compareDevices();
   void compareFilters();
   void compareSampling();
-  void compareCountryThresholds(const std::vector<std::string>& countries);
+  std::optional<SharesText> changedShares(const std::optional<double>& old,
+                                          const std::optional<double>& now) const;
+  std::map<std::string, Thresholds> countryThresholds() const;
+  void compareCountryThresholds();
   void compareHeld();
   void compareIdentifiers();
   void compareAddresses();

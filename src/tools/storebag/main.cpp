@@ -24,7 +24,10 @@ int main(int count, char** arguments) {
     const bool written =
         std::fwrite(text.data(), 1, text.size(), stream) == text.size() && std::fflush(stream) == 0;
     if (!written && given.outcome.done) std::perror("veltra-storebag: standard output");
-    return given.outcome.done && written && !given.outcome.findings ? 0 : 1;
+    for (const std::string& line : given.outcome.failures)
+      std::fprintf(stderr, "veltra-storebag: %s\n", line.c_str());
+    const bool clean = !given.outcome.findings && given.outcome.failures.empty();
+    return given.outcome.done && written && clean ? 0 : 1;
   } catch (const std::exception& error) {
     std::fprintf(stderr, "veltra-storebag: %s\n", error.what());
     return 1;

@@ -28,9 +28,13 @@ Outcome lint(const LintRequest& request) {
   std::string text;
   Array all;
   bool wrong = false;
+  std::vector<std::string> failures;
   for (const std::string& file : request.files) {
     const auto bag = readStorebag(file);
-    if (!bag && !bag.error().place) return {false, bag.error().line()};
+    if (!bag && !bag.error().place) {
+      failures.push_back(bag.error().line());
+      continue;
+    }
     const auto findings =
         bag ? lintStorebag(bag.value(), {request.lab}) : std::vector{findingOf(bag.error())};
     for (const Finding& finding : findings) {
@@ -42,8 +46,9 @@ Outcome lint(const LintRequest& request) {
       all.push_back(asDictionary(file, finding));
     }
   }
-  if (request.json) return {true, formats::writeJSON(all) + "\n", wrong};
-  return {true, text.empty() ? "nothing found\n" : text, wrong};
+  if (request.json) text = formats::writeJSON(all) + "\n";
+  if (text.empty() && failures.empty()) text = "nothing found\n";
+  return {true, std::move(text), wrong, std::move(failures)};
 }
 
 Outcome format(const FormatRequest& request) {
