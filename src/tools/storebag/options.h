@@ -6,6 +6,7 @@
 
 #include "config/storebag_signing.h"
 #include "storebag/commands.h"
+#include "storebag/publish.h"
 #include "tools/command_line.h"
 
 namespace veltrad::storebag {
@@ -15,6 +16,7 @@ struct Arguments {
   int bits = config::SigningKey::kFewestBits;
   bool json = false;
   SignRequest sign;
+  PublishRequest publish;
   LintRequest lint;
   FormatRequest format;
   ExplainRequest explain;
