@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 # SPDX-License-Identifier: Apache-2.0
 """What the other side takes on this machine: events through gateways and stream into the table, CPU time of each part for an event,
-beside the lab alone; memory of a gateway with 10,000 connections, of its own and through nginx. Prints lines for docs/fleet.md.
+beside the lab alone; memory of a gateway with 10,000 connections, of its own and through nginx. Prints lines.
 
   VELTRA_BUILD=build/release python3 bench/fleet.py [--seconds 10] [--connections 10000]"""
 import argparse
