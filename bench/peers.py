@@ -29,7 +29,7 @@ ADDED = {"_build": "21B74", "_clientVersion": "0", "_internal": "3", "_osVersion
          "clientName": "phone", "serviceName": "bench"}
 SYSLOG_NG = """@version: 3.38
 options {{ stats-level(1); }};
-source lines {{ unix-stream("{socket}" flags(syslog-protocol) log-iw-size(20000) log-fetch-limit(1000)); }};
+source lines {{ unix-stream("{socket}" flags(syslog-protocol) max-connections(2) log-iw-size(20000) log-fetch-limit(1000)); }};
 parser json {{ json-parser(prefix("e.")); }};
 destination posts {{ http(url("https://localhost:{port}/events") method("POST") headers("Content-Type: application/json") workers(1)
   batch-lines({batch}) batch-timeout(500) body-prefix("{{\\"events\\":[") delimiter(",") body-suffix("]}}")
@@ -128,10 +128,17 @@ class Peer:
         self.process = subprocess.Popen(self.command(), env=self.environment, stdout=(self.dir / "out").open("w"),
                                         stderr=subprocess.STDOUT)
         self.pid = self.process.pid
-        wait_until(lambda: os.path.exists(self.socket) or self.process.poll() is not None, self.name)
-        assert self.process.poll() is None, (self.dir / "out").read_text()
         self.stream = socket.socket(socket.AF_UNIX)
-        self.stream.connect(self.socket)
+        self.stream.settimeout(60)  # for a piece of a thousand messages
+        wait_until(lambda: self._connected() or self.process.poll() is not None, self.name)
+        assert self.process.poll() is None, (self.dir / "out").read_text()
+
+    def _connected(self):
+        try:
+            self.stream.connect(self.socket)
+            return True
+        except OSError:  # it does not listen yet
+            return False
 
     def send(self, count):
         for piece in lines(count):

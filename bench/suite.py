@@ -83,10 +83,13 @@ def main():
         run = measured(place, chosen, given)
         if not given.quick and not given.only:
             run.counts = counts.measure(place)
+        whole = not given.quick and not given.only and not given.pin
+        if whole:
+            run.write()  # a peer that fails takes nothing with it
         if given.peers or given.fluent_bit:
             run.peers = peers.measure(place, given)
         print(run.terminal())
-        if not given.quick and not given.only and not given.pin:
+        if whole:
             run.write()
         return 0
     finally:

@@ -28,7 +28,7 @@ _veltractl() {
     "/status") words=" --watch" ;;
     "/metrics") words="" ;;
     "/why") words=" --message --client-type --session-id --client-version --category --type --flag --client --service --backend --uploads --last" ;;
-    "/watch") words=" --message --client-type --session-id --client-version --category --type --flag --client --service --backend --uploads" ;;
+    "/watch") words=" --message --client-type --session-id --client-version --category --type --flag --client --service --backend --uploads --contents" ;;
     "/config/get") words="" ;;
     "/config/set") words="" ;;
     "/config/unset") words="" ;;

@@ -38,10 +38,15 @@ Sent VeltraBackend::sendNumberedMessage(NumberedMessage&& message) {
 }
 
 wire::StepEntry VeltraBackend::stepOf(const NumberedMessage& message) {
-  wire::StepEntry step;
-  step.message = message.note.number;
+  wire::StepEntry step = stepOf(message.note);
   step.time = platform::FateRing::microseconds(message.timestamp);
   step.eventNumber = message.eventID;
+  return step;
+}
+
+wire::StepEntry VeltraBackend::stepOf(const MessageNote& note) {
+  wire::StepEntry step;
+  step.message = note.number;
   if (_pen.writes()) step.standing = _standing.of(_pen, standing());
   return step;
 }

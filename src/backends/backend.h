@@ -91,6 +91,10 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Lower-case hexadecimal SHA-256 of the text's UTF-8 bytes, 64 characters.
   static std::string convertIntoSHA256(std::string_view text);
 
+  // Goes on where the one of the same name stopped that the session had before: its event number, and what
+  // waits in its batch. Called before the first message and before other threads know the back end; the other
+  // sends nothing from then on.
+  virtual void takeOver(VeltraBackend& before) { _eventID = before._eventID; }
   // Called before the session releases the back end.
   virtual void cleanup() {}
   virtual void updateState();
@@ -167,6 +171,8 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual ClientMatch clientMatch() const { return {}; }
   // What the record is to say of a step of the message, with how the back end stands. The session's thread.
   wire::StepEntry stepOf(const NumberedMessage& message);
+  // The same for a file or log data.
+  wire::StepEntry stepOf(const MessageNote& note);
   // Writes down a decision after which nothing more becomes of the message here.
   Sent settled(const NumberedMessage& message, wire::Decision decision);
 

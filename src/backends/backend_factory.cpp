@@ -31,8 +31,8 @@ class FixedDraw final : public platform::Random {
 
 std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
     const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
-    const SharedFacts& facts, bool oneShot) {
-  auto made = make(name, profile, productFamily, *facts, oneShot);
+    const SharedFacts& facts, bool oneShot, const std::optional<double>& draw) {
+  auto made = make(name, profile, productFamily, *facts, oneShot, draw);
   if (!made) return nullptr;
   made->setFacts(facts);
   made->keepFates(_services.fates);
@@ -41,13 +41,14 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
 
 std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    const SessionFacts& facts,
-                                                    [[maybe_unused]] bool oneShot) {
+                                                    const SessionFacts& facts, [[maybe_unused]] bool oneShot,
+                                                    const std::optional<double>& draw) {
   const std::string family = productFamily.value_or("");
-  const auto stable =
-      _services.sampling ? _services.sampling->stableFactor(facts.compType, name) : std::nullopt;
-  FixedDraw fixed(stable.value_or(0));
-  platform::Random& random = stable ? fixed : _services.random;
+  const auto known = draw                 ? draw
+                     : _services.sampling ? _services.sampling->stableFactor(facts.compType, name)
+                                          : std::nullopt;
+  FixedDraw fixed(known.value_or(0));
+  platform::Random& random = known ? fixed : _services.random;
 #ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName(

@@ -67,10 +67,12 @@ class BackendFactory {
         _posts(services.http, services.clock, services.counters, services.choices),
         _logData(services.http, services.counters) {}
   // Returns a back end that has these facts. Null, after one log line, if the name is unknown or the profile
-  // is not sufficient. `oneShot`: the back end serves a single message instead of a session.
+  // is not sufficient. `oneShot`: the back end serves a single message instead of a session. `draw`: its
+  // sampling factor, if it is not to draw one.
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
                                                     const std::optional<std::string>& productFamily,
-                                                    const SharedFacts& facts, bool oneShot = false);
+                                                    const SharedFacts& facts, bool oneShot = false,
+                                                    const std::optional<double>& draw = std::nullopt);
   // The one reason for which a kind of back end is not made, other than that something was short.
   static wire::Reason whyNotMade(std::string_view name);
   // Logs the lines that were held back. Called before the daemon ends.
@@ -87,7 +89,8 @@ class BackendFactory {
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,
                                       const std::optional<std::string>& productFamily,
-                                      const SessionFacts& facts, bool oneShot);
+                                      const SessionFacts& facts, bool oneShot,
+                                      const std::optional<double>& draw);
 
   const BackendServices _services;
   EventPosts _posts;

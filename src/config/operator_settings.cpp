@@ -23,6 +23,13 @@ constexpr Key later(const char* name, const KeyTable& inner, const char* byDefau
   return {name, dictionary, kUnbounded, optional, byDefault, meaning, &inner};
 }
 
+template <auto Member>
+constexpr Key chosen(const char* name, const char* choices, const char* byDefault, const char* meaning) {
+  Key key = row<Member>({name, choice, kUnbounded, optional, byDefault, meaning}).key;
+  key.choices = choices;
+  return key;
+}
+
 constexpr double kMostBytes = 1e15;
 constexpr Range kBytes{1, kMostBytes};
 constexpr Range kDays{1, 36'500};
@@ -33,16 +40,17 @@ constexpr std::array kStorebagChoiceKeys{
         {"persist", boolean, kUnbounded, optional, "false",
          "Keeps the last good storebag of each name on disk and verifies it again after a restart."})
         .key,
-    later("rollback", choice, kUnbounded, "a lower \"serial\" is taken",
-          "Refuses a storebag whose \"serial\" is lower than the highest seen for its name.", "refuse"),
-    later("expiry", choice, kUnbounded, "\"expires\" is not looked at",
-          "Refuses a storebag past its \"expires\" date.", "honour"),
-    later("names", choice, kUnbounded, "\"name\" is not looked at",
-          "Refuses a storebag whose \"name\" is not the one asked for.", "check"),
-    later("signature", choice, kUnbounded, "the RSA signature suffices",
-          "Asks for a good Ed25519 signature as well.", "ed25519"),
-    later("openSessions", choice, kUnbounded, "a session keeps the section of its start",
-          "Gives open sessions the new section of a storebag that changed.", "follow"),
+    chosen<&StorebagChoices::rollback>(
+        "rollback", "refuse", "a lower \"serial\" is taken",
+        "Refuses a storebag whose \"serial\" is lower than the highest seen for its name, or missing."),
+    chosen<&StorebagChoices::expiry>("expiry", "honour", "\"expires\" is not looked at",
+                                     "Refuses a storebag past its \"expires\" date and stops using one."),
+    chosen<&StorebagChoices::names>("names", "check", "\"name\" is not looked at",
+                                    "Refuses a storebag whose \"name\" is not the one asked for."),
+    chosen<&StorebagChoices::ed25519>("signature", "ed25519", "the RSA signature suffices",
+                                      "Asks for a good Ed25519 signature by one of \"keys\" as well."),
+    chosen<&StorebagChoices::follow>("openSessions", "follow", "a session keeps the section of its start",
+                                     "Gives open sessions the new section of a storebag that changed."),
 };
 
 constexpr std::array kFatesKeys{
@@ -87,7 +95,12 @@ constexpr std::array kSettingsKeys{
     row<&OperatorChoices::storebags>({"storebags", dictionary, kUnbounded, optional, "none of them",
                                       "What is done with storebags.", &StorebagChoices::kKeys})
         .key,
-    later("keys", texts, kUnbounded, "publicKey.der alone", "Files of further public keys under keys/."),
+    row<&OperatorChoices::keys>(
+        {"keys", texts, kUnbounded, optional, "publicKey.der alone",
+         "Names of files in etc/veltrad/keys with further public keys, RSA or Ed25519, DER or PEM. A "
+         "storebag "
+         "is taken by any RSA key of them and publicKey.der that no accepted storebag names in \"revoked\"."})
+        .key,
     row<&OperatorChoices::fates>({"fates", dictionary, kUnbounded, optional, "as its keys say",
                                   "The record of what became of messages.", &FatesChoices::kKeys})
         .key,
@@ -115,6 +128,11 @@ void take(const Key&, const Value& value, FatesChoices& field) {
 
 void take(const Key&, const Value& value, CompressionChoices& field) {
   if (const Dictionary* dictionary = value.asDictionary()) field = parsed<CompressionChoices>(*dictionary);
+}
+
+void take(const Key& key, const Value& value, Chosen& field) {
+  const std::string* text = value.asString();
+  field.on = text && *text == key.choices;
 }
 
 void take(const Key&, const Value& value, Sampling& field) {

@@ -11,9 +11,21 @@
 
 namespace veltrad::config {
 
-// "storebags".
+// A key whose one value switches something on.
+struct Chosen {
+  bool on = false;
+  operator bool() const { return on; }
+};
+void take(const Key& key, const Value& value, Chosen& field);
+
+// "storebags". What each means is written at its key.
 struct StorebagChoices {
   bool persist = false;  // the last good section of each name survives a restart
+  Chosen rollback;
+  Chosen expiry;
+  Chosen names;
+  Chosen ed25519;
+  Chosen follow;
 
   static const KeyTable kKeys;
 };
@@ -44,6 +56,7 @@ void take(const Key& key, const Value& value, Sampling& field);
 struct OperatorChoices {
   Sampling sampling = Sampling::drawn;
   StorebagChoices storebags;
+  TextList keys;  // files in Root::keysDirectory()
   FatesChoices fates;
   CompressionChoices compression;
 

@@ -13,6 +13,18 @@ std::optional<std::string> textUnder(const Dictionary& dictionary, std::string_v
   return text != nullptr ? std::optional(*text) : std::nullopt;
 }
 
+std::vector<FurtherSignature> signaturesIn(const Dictionary& container) {
+  std::vector<FurtherSignature> found;
+  const Array* array = container.array("signatures");
+  for (std::size_t i = 0; array && i < array->size() && i < kMostFurtherSignatures; ++i) {
+    const Dictionary* one = (*array)[i].asDictionary();
+    const std::string* key = one ? one->string("key") : nullptr;
+    const std::string* signature = one ? one->string("ed25519") : nullptr;
+    if (key && signature) found.push_back({*key, *signature});
+  }
+  return found;
+}
+
 }  // namespace
 
 Result<StorebagContainer, PropertyListError> parseStorebagContainer(std::string_view bytes) {
@@ -20,7 +32,8 @@ Result<StorebagContainer, PropertyListError> parseStorebagContainer(std::string_
   if (!list) return Failure{list.error()};
   const Dictionary* dictionary = list.value().asDictionary();
   if (dictionary == nullptr) return StorebagContainer{};
-  return StorebagContainer{textUnder(*dictionary, "signature"), textUnder(*dictionary, "bag")};
+  return StorebagContainer{textUnder(*dictionary, "signature"), textUnder(*dictionary, "bag"),
+                           signaturesIn(*dictionary)};
 }
 
 std::optional<SignedStorebag> decodeStorebagContainer(const StorebagContainer& container) {

@@ -6,6 +6,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/property_list.h"
 #include "base/result.h"
@@ -26,10 +27,19 @@ inline constexpr PropertyListLimits kStorebagBagLimits{.bytes = kStorebagMostCon
                                                        .objects = 65'536,
                                                        .textBytes = kStorebagMostContainerBytes};
 
+// One more signature over the decoded bag: {"key", "ed25519"}.
+struct FurtherSignature {
+  std::string key;      // the first 16 digits of the key's fingerprint
+  std::string ed25519;  // in base64
+};
+// As many are read; further ones are not looked at, because each costs a digest of the whole bag.
+inline constexpr std::size_t kMostFurtherSignatures = 16;
+
 // The texts of the container, in base64: the signature over the decoded bag, and the bag, a property list.
 struct StorebagContainer {
   std::optional<std::string> signature;
   std::optional<std::string> bag;
+  std::vector<FurtherSignature> signatures = {};  // what "signatures" holds of that form
 };
 
 // A property list that is not a dictionary gives an empty container.

@@ -62,6 +62,7 @@ struct StorebagOrigin {
   std::string name;                    // of the storebag
   std::optional<std::string> version;  // which it need not have
   std::string section;
+  std::optional<std::string> expires = {};  // as given
 };
 
 // The back ends of one environment.
@@ -84,6 +85,10 @@ struct Storebag {
   std::optional<std::string> version;
   // In seconds, within 32 bits.
   std::optional<std::int64_t> refreshCycle;
+  // For StorebagClaims.
+  std::optional<std::int64_t> serial;
+  std::optional<std::string> expires;
+  std::optional<std::string> name;
 
   bool operator==(const Storebag&) const = default;
   static const KeyTable kKeys;

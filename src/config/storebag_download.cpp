@@ -1,8 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Downloads storebags and verifies their signatures.
+// Downloads storebags.
 #include "config/storebag_download.h"
-
-#include <fmt/format.h>
 
 #include <algorithm>
 #include <chrono>
@@ -11,7 +9,7 @@
 #include "base/text.h"
 #include "config/process_settings.h"
 #include "config/storebag_container.h"
-#include "config/storebag_key.h"
+#include "config/storebag_trust.h"
 #include "http/http_client.h"
 #include "platform/log.h"
 #include "support/veltra.h"
@@ -114,11 +112,12 @@ Dictionary defaultStorebag() {
 }
 
 StorebagDownload::StorebagDownload(http::HTTPClient& http, ProcessSettings& settings,
-                                   const support::Veltra& veltra)
-    : _http(http), _settings(settings), _veltra(veltra) {}
+                                   const support::Veltra& veltra, StorebagTrust& trust)
+    : _http(http), _settings(settings), _veltra(veltra), _trust(trust) {}
 
 WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& name,
-                                                            const std::optional<std::string>& lastModified) {
+                                                            const std::optional<std::string>& lastModified,
+                                                            const OperatorChoices& choices) {
   WholeStorebagAnswer answer;
   const auto without = [&](const std::string& server, const http::HTTPError& error) {
     answer = withoutAnswer(name, server, error);
@@ -143,12 +142,13 @@ WholeStorebagAnswer StorebagDownload::fetchStorebagWithName(const std::string& n
     answer.kind = StorebagAnswer::Kind::notModified;
     return answer;
   }
-  auto storebag = verifiedStorebag(response.body);
+  auto storebag = _trust.accepted(name, response.body, choices);
   if (!storebag) {
     answer.attempted = storebag.error().cause != StorebagCause::noAttempt;
     answer.cause = storebag.error().cause;
     answer.why = std::move(storebag.error().why);
     answer.genuine = storebag.error().genuine;
+    answer.refusal = storebag.error().reason;
     return answer;
   }
   answer.genuine = true;
@@ -180,49 +180,6 @@ WholeStorebagAnswer StorebagDownload::withoutAnswer(const std::string& name, con
   answer.kind = StorebagAnswer::Kind::fetched;
   answer.storebag = defaultStorebag();
   return answer;
-}
-
-Result<Dictionary, StorebagDownload::Refusal> StorebagDownload::verifiedStorebag(
-    std::string_view body) const {
-  using Cause = StorebagCause;
-  const auto container = parseStorebagContainer(body);
-  if (!container) {
-    const std::string& why = container.error().description();
-    logError("fetchStorebagWithName: propertyListWithData error %s", why.c_str());
-    logError("fetchStorebagWithName: Signature is missing");
-    return Failure{Refusal{Cause::noStorebag, "the answer is no property list: " + why, {}}};
-  }
-  if (!container.value().signature) {
-    logError("fetchStorebagWithName: Signature is missing");
-    return Failure{Refusal{Cause::signature, "the answer is not signed: it has no \"signature\"", false}};
-  }
-  const auto der = _veltra.publicKeyDER();
-  if (!der) {
-    const Cause cause = der.error().passes() ? Cause::noAttempt : Cause::publicKey;
-    return Failure{Refusal{cause, der.error().description, {}}};
-  }
-  const std::optional<StorebagKey> key = StorebagKey::fromDER(der.value());
-  if (!key) {
-    return Failure{
-        Refusal{Cause::publicKey,
-                fmt::format("{} is no RSA public key in DER form of {} to {} bits", _veltra.publicKeyPath(),
-                            StorebagKey::kFewestModulusBits, StorebagKey::kMostModulusBits),
-                {}}};
-  }
-  const std::optional<SignedStorebag> decoded = decodeStorebagContainer(container.value());
-  if (!decoded) {
-    return Failure{Refusal{Cause::signature, "\"signature\" or \"bag\" of the answer is no base64", false}};
-  }
-  if (!key->verifies(decoded->bag, decoded->signature)) {
-    logError("fetchStorebagWithName: Signature can not be verified, %p", key->identity());
-    return Failure{Refusal{Cause::signature,
-                           fmt::format("the signature is not by the key in {} (SHA-256 {})",
-                                       _veltra.publicKeyPath(), key->fingerprint()),
-                           false}};
-  }
-  auto storebag = parseStorebagBag(decoded->bag);
-  if (!storebag) return Failure{Refusal{Cause::content, "the signed \"bag\" is no property list", true}};
-  return std::move(*storebag);
 }
 
 }  // namespace veltrad::config

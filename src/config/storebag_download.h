@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Downloads storebags and verifies their signatures. Blocks the caller's thread.
+// Downloads storebags and has their containers judged. Blocks the caller's thread.
 #pragma once
 
 #include <cstdint>
@@ -7,7 +7,6 @@
 #include <string>
 #include <string_view>
 
-#include "base/result.h"
 #include "base/value.h"
 #include "config/storebag_source.h"
 
@@ -23,6 +22,8 @@ class Veltra;
 namespace veltrad::config {
 
 class ProcessSettings;
+class StorebagTrust;
+struct OperatorChoices;
 
 // The lifetime in seconds by a "Cache-Control" value: the leading integer of the component after the first
 // "max-age", where components end at every "=" and every space; clamped to 32 bits. 86,400 if there is none.
@@ -40,19 +41,13 @@ struct WholeStorebagAnswer : StorebagAnswer {
 // it.
 class StorebagDownload {
  public:
-  StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra);
+  StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra,
+                   StorebagTrust& trust);
 
   // `lastModified`, the "Last-Modified" text of the caller's copy, makes the request conditional.
   WholeStorebagAnswer fetchStorebagWithName(const std::string& name,
-                                            const std::optional<std::string>& lastModified);
-
-  struct Refusal {
-    StorebagCause cause;  // noAttempt: the key is out of reach just now
-    std::string why;
-    std::optional<bool> genuine;  // as in StorebagAnswer
-  };
-  // The storebag in the bytes of a container, by the key of today. A refusal has been logged.
-  Result<Dictionary, Refusal> verifiedStorebag(std::string_view container) const;
+                                            const std::optional<std::string>& lastModified,
+                                            const OperatorChoices& choices);
 
  private:
   WholeStorebagAnswer withoutAnswer(const std::string& name, const std::string& server,
@@ -61,6 +56,7 @@ class StorebagDownload {
   http::HTTPClient& _http;
   ProcessSettings& _settings;
   const support::Veltra& _veltra;
+  StorebagTrust& _trust;
 };
 
 }  // namespace veltrad::config

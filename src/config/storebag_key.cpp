@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Verifies RSA signatures with OpenSSL's EVP interface, which checks digest and padding.
+// Verifies signatures with OpenSSL's EVP interface, which checks digest and padding.
 #include "config/storebag_key.h"
 
 #include <fmt/format.h>
@@ -8,6 +8,7 @@
 #include <openssl/decoder.h>
 #include <openssl/err.h>
 #include <openssl/evp.h>
+#include <openssl/pem.h>
 #include <openssl/provider.h>
 #include <openssl/rsa.h>
 #include <openssl/x509.h>
@@ -22,10 +23,11 @@ using Provider = Owned<OSSL_PROVIDER, OSSL_PROVIDER_unload>;
 using PublicKey = Owned<EVP_PKEY, EVP_PKEY_free>;
 using Number = Owned<BIGNUM, BN_free>;
 using Decoder = Owned<OSSL_DECODER_CTX, OSSL_DECODER_CTX_free>;
+using Memory = Owned<BIO, BIO_free>;
 using DigestContext = Owned<EVP_MD_CTX, EVP_MD_CTX_free>;
 
 struct OpenSSLFree {
-  void operator()(unsigned char* bytes) const { OPENSSL_free(bytes); }
+  void operator()(void* bytes) const { OPENSSL_free(bytes); }
 };
 
 const unsigned char* bytesOf(std::string_view text) {
@@ -39,10 +41,11 @@ class ErrorQueueAsItWas {
   ~ErrorQueueAsItWas() { ERR_pop_to_mark(); }
 };
 
-PublicKey decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* library) {
+PublicKey decodeKey(std::string_view der, const char* structure, const char* algorithm,
+                    OSSL_LIB_CTX* library) {
   EVP_PKEY* key = nullptr;
-  const Decoder decoder(
-      OSSL_DECODER_CTX_new_for_pkey(&key, "DER", structure, "RSA", EVP_PKEY_PUBLIC_KEY, library, nullptr));
+  const Decoder decoder(OSSL_DECODER_CTX_new_for_pkey(&key, "DER", structure, algorithm, EVP_PKEY_PUBLIC_KEY,
+                                                      library, nullptr));
   const unsigned char* at = bytesOf(der);
   std::size_t left = der.size();
   const bool decoded = decoder != nullptr && OSSL_DECODER_from_data(decoder.get(), &at, &left) == 1;
@@ -50,7 +53,21 @@ PublicKey decodeKey(std::string_view der, const char* structure, OSSL_LIB_CTX* l
   return decoded && left == 0 ? std::move(held) : nullptr;
 }
 
+// The bytes of the first block of a PEM file; absent if there is none.
+std::optional<std::string> firstBlock(std::string_view pem) {
+  const Memory memory(BIO_new_mem_buf(pem.data(), static_cast<int>(pem.size())));
+  char* name = nullptr;
+  char* header = nullptr;
+  unsigned char* bytes = nullptr;
+  long length = 0;
+  if (!memory || PEM_read_bio(memory.get(), &name, &header, &bytes, &length) != 1) return std::nullopt;
+  const std::unique_ptr<unsigned char, OpenSSLFree> held(bytes);
+  const std::unique_ptr<char, OpenSSLFree> heldName(name), heldHeader(header);
+  return std::string(reinterpret_cast<char*>(bytes), static_cast<std::size_t>(length));
+}
+
 bool isUsable(const EVP_PKEY* key) {
+  if (EVP_PKEY_is_a(key, "ED25519") == 1) return true;
   if (EVP_PKEY_is_a(key, "RSA") != 1) return false;
   const int bits = EVP_PKEY_get_bits(key);
   if (bits < StorebagKey::kFewestModulusBits || bits > StorebagKey::kMostModulusBits) return false;
@@ -70,17 +87,36 @@ struct StorebagKey::Held {
   PublicKey key;
 };
 
-std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {
+std::optional<StorebagKey> StorebagKey::fromEither(std::string_view der, bool ed25519) {
   const ErrorQueueAsItWas errors;
   const auto held = std::make_shared<Held>();
   held->library.reset(OSSL_LIB_CTX_new());
   if (!held->library) return std::nullopt;
   held->provider.reset(OSSL_PROVIDER_load(held->library.get(), "default"));
   if (!held->provider) return std::nullopt;
-  held->key = decodeKey(der, "SubjectPublicKeyInfo", held->library.get());
-  if (!held->key) held->key = decodeKey(der, "type-specific", held->library.get());
+  held->key = decodeKey(der, "SubjectPublicKeyInfo", "RSA", held->library.get());
+  if (!held->key) held->key = decodeKey(der, "type-specific", "RSA", held->library.get());
+  if (!held->key && ed25519)
+    held->key = decodeKey(der, "SubjectPublicKeyInfo", "ED25519", held->library.get());
   if (!held->key || !isUsable(held->key.get())) return std::nullopt;
   return StorebagKey(held);
+}
+
+std::optional<StorebagKey> StorebagKey::fromDER(std::string_view der) {
+  return fromEither(der, false);
+}
+
+std::optional<StorebagKey> StorebagKey::fromFile(std::string_view bytes) {
+  constexpr std::size_t kMostBytes = 1u << 16;
+  if (bytes.size() > kMostBytes) return std::nullopt;
+  if (auto key = fromEither(bytes, true)) return key;
+  const ErrorQueueAsItWas errors;
+  const auto block = firstBlock(bytes);
+  return block ? fromEither(*block, true) : std::nullopt;
+}
+
+StorebagKey::Kind StorebagKey::kind() const {
+  return EVP_PKEY_is_a(_held->key.get(), "ED25519") == 1 ? Kind::ed25519 : Kind::rsa;
 }
 
 bool StorebagKey::verifies(std::string_view bag, std::string_view signature) const {
@@ -88,6 +124,13 @@ bool StorebagKey::verifies(std::string_view bag, std::string_view signature) con
   EVP_PKEY* key = _held->key.get();
   if (signature.size() != static_cast<std::size_t>(EVP_PKEY_get_size(key))) return false;
   const DigestContext context(EVP_MD_CTX_new());
+  if (kind() == Kind::ed25519) {
+    return context != nullptr &&
+           EVP_DigestVerifyInit_ex(context.get(), nullptr, nullptr, _held->library.get(), nullptr, key,
+                                   nullptr) == 1 &&
+           EVP_DigestVerify(context.get(), bytesOf(signature), signature.size(), bytesOf(bag), bag.size()) ==
+               1;
+  }
   EVP_PKEY_CTX* settings = nullptr;  // owned by `context`
   return context != nullptr &&
          EVP_DigestVerifyInit_ex(context.get(), &settings, "SHA1", _held->library.get(), nullptr, key,

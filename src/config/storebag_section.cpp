@@ -11,6 +11,7 @@
 #include "config/process_settings.h"
 #include "config/storebag_content.h"
 #include "config/storebag_store.h"
+#include "config/storebag_trust.h"
 #include "platform/counters.h"
 #include "platform/log.h"
 
@@ -27,9 +28,10 @@ Storebag takeSection(const char* name, const Dictionary& whole, std::uint32_t en
   if (const Dictionary* section = sectionOf(storebag, environment)) {
     const bool standsIn = environment == kSeedEnvironment && !storebag.seed;
     answer.kind = StorebagAnswer::Kind::fetched;
-    answer.section = parseSection(
-        *section,
-        {name, storebag.version, sectionNameForEnvironment(standsIn ? kReleaseEnvironment : environment)});
+    answer.section =
+        parseSection(*section, {name, storebag.version,
+                                sectionNameForEnvironment(standsIn ? kReleaseEnvironment : environment),
+                                storebag.expires});
     answer.version = storebag.version;
   }
   return storebag;
@@ -50,10 +52,12 @@ const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment)
 }
 
 StorebagSections::StorebagSections(http::HTTPClient& http, ProcessSettings& settings,
-                                   const support::Veltra& veltra, OperatorSettings& choices,
-                                   StorebagStore& store, platform::Counters& counters)
+                                   const support::Veltra& veltra, StorebagTrust& trust,
+                                   OperatorSettings& choices, StorebagStore& store,
+                                   platform::Counters& counters)
     : _settings(settings),
-      _download(http, settings, veltra),
+      _download(http, settings, veltra, trust),
+      _trust(trust),
       _choices(choices),
       _store(store),
       _counters(counters) {}
@@ -81,8 +85,10 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   // What is to be kept must come whole once.
   const bool conditional = !persist || _store.holds(name);
   WholeStorebagAnswer whole =
-      _download.fetchStorebagWithName(name, conditional ? lastModified : std::nullopt);
+      _download.fetchStorebagWithName(name, conditional ? lastModified : std::nullopt, *choices);
   StorebagSectionAnswer answer{whole, nullptr, {}};
+  // What was refused is not held, and may be right once its key or the clock is: it is to come whole again.
+  if (answer.kind == Kind::failed && StorebagRules::of(*choices).any()) answer.lastModified = lastModified;
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
              clientType);
@@ -128,10 +134,12 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   if (!stored) return kept;
   kept.known = !stored.value();
   if (kept.known) return kept;
-  const auto whole = _download.verifiedStorebag(stored.value()->container);
+  const auto whole = _trust.accepted(name, stored.value()->container, *choices);
   if (!whole) {
-    kept.known = whole.error().cause != StorebagCause::noAttempt;
-    if (kept.known) _store.remove(name, "its signature cannot be verified");
+    const StorebagTrust::Refusal& refusal = whole.error();
+    kept.known = refusal.cause != StorebagCause::noAttempt;
+    const bool refused = refusal.cause == StorebagCause::refused;
+    if (kept.known) _store.remove(name, refused ? refusal.why : "its signature cannot be verified");
     return kept;
   }
   const std::optional<std::uint32_t> environment = _settings.currentEnvironment();
@@ -143,6 +151,12 @@ KeptSection StorebagSections::keptStorebag(std::int32_t clientType) {
   kept.answer.lastModified = std::move(stored.value()->lastModified);
   kept.fetchTime = stored.value()->fetchTime;
   return kept;
+}
+
+std::optional<std::string> StorebagSections::whyNotUsed(const StorebagSection& section) {
+  if (!section.origin.expires) return std::nullopt;
+  const auto choices = _choices.current();
+  return choices && choices->storebags.expiry ? _trust.whyExpired(section.origin.expires) : std::nullopt;
 }
 
 // Clients can cause it at will.

@@ -14,6 +14,7 @@ namespace veltrad::config {
 
 class OperatorSettings;
 class StorebagStore;
+class StorebagTrust;
 struct Storebag;
 
 // The section that devices of an environment use; null if there is none. Of "seed" without a section it is
@@ -26,17 +27,20 @@ const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment)
 class StorebagSections final : public StorebagSource {
  public:
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra,
-                   OperatorSettings& choices, StorebagStore& store, platform::Counters& counters);
+                   StorebagTrust& trust, OperatorSettings& choices, StorebagStore& store,
+                   platform::Counters& counters);
 
   StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) override;
   KeptSection keptStorebag(std::int32_t clientType) override;
+  std::optional<std::string> whyNotUsed(const StorebagSection& section) override;
 
  private:
   void refuse(std::int32_t clientType);
 
   ProcessSettings& _settings;
   StorebagDownload _download;
+  StorebagTrust& _trust;
   OperatorSettings& _choices;
   StorebagStore& _store;
   platform::Counters& _counters;

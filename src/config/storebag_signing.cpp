@@ -13,6 +13,7 @@
 
 #include "base/base64.h"
 #include "base/freed.h"
+#include "config/storebag_key.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 
@@ -40,6 +41,17 @@ int noPassphrase(char*, int, int, void*) {
   return -1;
 }
 
+Result<PrivateKey, std::string> keyIn(const std::string& path, const char* algorithm, const char* expected) {
+  platform::DiskFileStore files;
+  const auto pem = files.read(path, kMostKeyFileBytes);
+  if (!pem) return Failure{pem.error().description};
+  const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())));
+  PrivateKey key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
+  if (!key || EVP_PKEY_is_a(key.get(), algorithm) != 1)
+    return Failure{path + ": expected " + expected + " private key in PEM form, not encrypted"};
+  return key;
+}
+
 }  // namespace
 
 SigningKey::SigningKey(PrivateKey key) : _key(std::move(key)) {}
@@ -51,19 +63,26 @@ SigningKey SigningKey::generate(int bits) {
   return SigningKey(std::move(key));
 }
 
+SigningKey SigningKey::generateEd25519() {
+  PrivateKey key(EVP_PKEY_Q_keygen(nullptr, nullptr, "ED25519"), EVP_PKEY_free);
+  if (!key) abortFor("make a key");
+  return SigningKey(std::move(key));
+}
+
 Result<SigningKey, std::string> SigningKey::load(const std::string& path) {
-  platform::DiskFileStore files;
-  const auto pem = files.read(path, kMostKeyFileBytes);
-  if (!pem) return Failure{pem.error().description};
-  const Memory memory(BIO_new_mem_buf(pem.value().data(), static_cast<int>(pem.value().size())));
-  PrivateKey key(PEM_read_bio_PrivateKey(memory.get(), nullptr, noPassphrase, nullptr), EVP_PKEY_free);
-  if (!key || EVP_PKEY_is_a(key.get(), "RSA") != 1)
-    return Failure{path + ": expected an RSA private key in PEM form, not encrypted"};
-  const int bits = EVP_PKEY_get_bits(key.get());
+  auto key = keyIn(path, "RSA", "an RSA");
+  if (!key) return Failure{key.error()};
+  const int bits = EVP_PKEY_get_bits(key.value().get());
   if (bits < kFewestBits || bits > kMostBits)
     return Failure{path + ": the key has " + std::to_string(bits) + " bits, expected " +
                    std::to_string(kFewestBits) + " to " + std::to_string(kMostBits)};
-  return SigningKey(std::move(key));
+  return SigningKey(std::move(key).value());
+}
+
+Result<SigningKey, std::string> SigningKey::loadEd25519(const std::string& path) {
+  auto key = keyIn(path, "ED25519", "an Ed25519");
+  if (!key) return Failure{key.error()};
+  return SigningKey(std::move(key).value());
 }
 
 std::string SigningKey::privatePEM() const {
@@ -79,15 +98,23 @@ std::string SigningKey::publicDER() const {
   return contentsOf(memory.get());
 }
 
+std::string SigningKey::fingerprint() const {
+  const auto key = StorebagKey::fromFile(publicDER());
+  if (!key) abortFor("read the public half of a key");
+  return key->fingerprint();
+}
+
 std::string SigningKey::sign(std::string_view bag) const {
   const Owned<EVP_MD_CTX, EVP_MD_CTX_free> context(EVP_MD_CTX_new());
   std::string signature(static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())), '\0');
   std::size_t length = signature.size();
+  const bool isRSA = EVP_PKEY_is_a(_key.get(), "RSA") == 1;
   EVP_PKEY_CTX* settings = nullptr;  // owned by `context`
   const bool isSigned =
       context != nullptr &&
-      EVP_DigestSignInit_ex(context.get(), &settings, "SHA1", nullptr, nullptr, _key.get(), nullptr) == 1 &&
-      EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1 &&
+      EVP_DigestSignInit_ex(context.get(), &settings, isRSA ? "SHA1" : nullptr, nullptr, nullptr, _key.get(),
+                            nullptr) == 1 &&
+      (!isRSA || EVP_PKEY_CTX_set_rsa_padding(settings, RSA_PKCS1_PADDING) == 1) &&
       EVP_DigestSign(context.get(), reinterpret_cast<unsigned char*>(signature.data()), &length,
                      reinterpret_cast<const unsigned char*>(bag.data()), bag.size()) == 1;
   if (!isSigned) abortFor("sign");
@@ -99,9 +126,16 @@ std::string makeStorebagContainer(const SigningKey& key, const Dictionary& store
   return makeStorebagContainerAround(key, formats::writeXMLPropertyList(storebag));
 }
 
-std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag) {
-  return formats::writeXMLPropertyList(
-      Dictionary{{"signature", encodeBase64(key.sign(bag))}, {"bag", encodeBase64(bag)}});
+std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag,
+                                        const std::vector<SigningKey>& further) {
+  Dictionary container{{"signature", encodeBase64(key.sign(bag))}, {"bag", encodeBase64(bag)}};
+  Array signatures;
+  for (const SigningKey& one : further) {
+    signatures.push_back(Dictionary{{"key", one.fingerprint().substr(0, StorebagKey::kShortFingerprint)},
+                                    {"ed25519", encodeBase64(one.sign(bag))}});
+  }
+  if (!signatures.empty()) container.set("signatures", std::move(signatures));
+  return formats::writeXMLPropertyList(container);
 }
 
 }  // namespace veltrad::config

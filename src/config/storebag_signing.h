@@ -5,6 +5,7 @@
 #include <memory>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "base/result.h"
 #include "base/value.h"
@@ -13,7 +14,8 @@ struct evp_pkey_st;
 
 namespace veltrad::config {
 
-// An RSA private key, shared by copies. Signs with PKCS#1 v1.5 and SHA-1, which the daemon verifies.
+// A private key, shared by copies. RSA signs with PKCS#1 v1.5 and SHA-1, which the daemon verifies; Ed25519
+// signs beside it.
 class SigningKey {
  public:
   static constexpr int kFewestBits = 2'048;
@@ -24,11 +26,17 @@ class SigningKey {
   // From a PEM file (PKCS#8 or PKCS#1, not encrypted). The error names the path and what was expected.
   static Result<SigningKey, std::string> load(const std::string& path);
 
+  // The same for Ed25519 (PKCS#8).
+  static SigningKey generateEd25519();
+  static Result<SigningKey, std::string> loadEd25519(const std::string& path);
+
   // PKCS#8.
   std::string privatePEM() const;
   // SubjectPublicKeyInfo.
   std::string publicDER() const;
-  // The signature over the SHA-1 digest of `bag`.
+  // As in StorebagKey.
+  std::string fingerprint() const;
+  // The signature of `bag`.
   std::string sign(std::string_view bag) const;
 
  private:
@@ -38,7 +46,8 @@ class SigningKey {
 
 // An XML property list with the base64 texts "signature" and "bag", the latter of the storebag in XML form.
 std::string makeStorebagContainer(const SigningKey& key, const Dictionary& storebag);
-// The same for a bag of any bytes.
-std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag);
+// The same for a bag of any bytes. With Ed25519 keys in `further`, "signatures" holds theirs.
+std::string makeStorebagContainerAround(const SigningKey& key, std::string_view bag,
+                                        const std::vector<SigningKey>& further = {});
 
 }  // namespace veltrad::config

@@ -7,6 +7,8 @@
 #include <optional>
 #include <string>
 
+#include "wire/reasons.h"
+
 namespace veltrad::config {
 
 struct StorebagSection;
@@ -24,6 +26,7 @@ enum class StorebagCause {
   publicKey,   // this device has no key that could verify it
   signature,   // missing, or not by this device's key
   content,     // signed, but no storebag
+  refused,     // signed, but not to be used: see `refusal`
   noSection,   // nothing for this environment
 };
 
@@ -39,9 +42,10 @@ struct StorebagAnswer {
   // For the next request: the answer's text, even if the answer was not valid, or that of this request.
   std::optional<std::string> lastModified;
   StorebagCause cause = StorebagCause::none;
-  std::string why;              // one line about the cause; empty for `none`
-  int status = 0;               // of the HTTP answer; 0: none came
-  std::optional<bool> genuine;  // whether the signature holds; absent: nothing was verified
+  std::string why;                           // one line about the cause; empty for `none`
+  int status = 0;                            // of the HTTP answer; 0: none came
+  std::optional<bool> genuine;               // whether the signature holds; absent: nothing was verified
+  std::optional<wire::Reason> refusal = {};  // of cause `refused`
 };
 
 struct StorebagSectionAnswer : StorebagAnswer {
@@ -68,6 +72,9 @@ class StorebagSource {
       std::int32_t clientType, const std::optional<std::string>& lastModified) = 0;
   // What is kept of the client type's storebag, verified again; it has a section, or nothing is there to use.
   virtual KeptSection keptStorebag(std::int32_t) { return {}; }
+  // Why a section that was fetched before is not to be used any more: "expired on …". Nothing: it is. Takes
+  // leaf locks only.
+  virtual std::optional<std::string> whyNotUsed(const StorebagSection&) { return std::nullopt; }
 };
 
 }  // namespace veltrad::config

@@ -25,10 +25,15 @@ Daemon::Daemon(Services& services)
                 _library, services.pool, services.lentFiles, services.root.preferencesDirectory(), &_sampling,
                 &services.gate, &_fates}),
       _storebagStore(services.files, services.clock, services.root.storebagsDirectory()),
-      _storebags(services.http, _settings, _library, _choices, _storebagStore, services.counters),
+      _seenStorebags(services.files, services.root.seenStorebagsPath()),
+      _storebagTrust(_library, services.files, _seenStorebags, services.clock, services.counters,
+                     services.root.keysDirectory()),
+      _storebags(services.http, _settings, _library, _storebagTrust, _choices, _storebagStore,
+                 services.counters),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
               services.counters, _flushes, _messageLog, services.gate, &_fates},
              _storebags, services.transaction),
+      _follower(_agent, _choices),
       _privacy(services, _agent, _factory, _library) {}
 
 void Daemon::readConfigurationAgain() {

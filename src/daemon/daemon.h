@@ -6,10 +6,13 @@
 #include "backends/sampling_factors.h"
 #include "config/operator_settings.h"
 #include "config/process_settings.h"
+#include "config/seen_storebags_file.h"
 #include "config/storebag_section.h"
 #include "config/storebag_store.h"
+#include "config/storebag_trust.h"
 #include "daemon/privacy.h"
 #include "daemon/services.h"
+#include "daemon/storebag_follower.h"
 #include "daemon/veltrad_agent.h"
 #include "platform/fate_ring.h"
 #include "session/flush_counters.h"
@@ -20,18 +23,20 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 14 fields are these objects, in the order in which they need each other.
+// 18 fields are these objects, in the order in which they need each other, whatever the padding.
+// NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding)
 class Daemon {
  public:
   explicit Daemon(Services& services);
   VeltradAgent& agent() { return _agent; }
   backends::BackendFactory& backends() { return _factory; }
   Privacy& privacy() { return _privacy; }
+  StorebagFollower& follower() { return _follower; }
   // Every file under etc/veltrad, now. Certificates are read by the first connection after they have changed.
   void readConfigurationAgain();
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
-  const platform::FateRing& fates() const { return _fates; }
+  platform::FateRing& fates() { return _fates; }
 
  private:
   Services& _services;
@@ -45,8 +50,11 @@ class Daemon {
   session::FlushCounters _flushes;
   backends::BackendFactory _factory;
   config::StorebagStore _storebagStore;
+  config::SeenStorebagsFile _seenStorebags;
+  config::StorebagTrust _storebagTrust;
   config::StorebagSections _storebags;
   VeltradAgent _agent;
+  StorebagFollower _follower;
   Privacy _privacy;
 };
 

@@ -2,17 +2,14 @@
 // Each check by itself; those about the server know what was found on the way to it.
 #include "daemon/diagnosis.h"
 
-#include <fmt/chrono.h>
 #include <fmt/format.h>
 
 #include <algorithm>
-#include <ctime>
 #include <iterator>
 
 #include "base/text.h"
-#include "base/version.h"
-#include "config/preference_keys.h"
 #include "config/process_settings.h"
+#include "daemon/machine_checks.h"
 #include "wire/constants.h"
 
 namespace veltrad::daemon {
@@ -153,6 +150,17 @@ Check checkTrust(const StorebagFacts& facts, const Check& resolved) {
   return ok(kName, "the server's certificate is trusted");
 }
 
+// The check `name` for a storebag that a rule of the operator refuses; nothing if there is none.
+std::optional<Check> checkOfRefusal(const char* name, const StorebagFacts& facts, bool ofSignature) {
+  const auto is = [ofSignature](const StorebagFinding& one) {
+    return one.answer.refusal && concernsSignature(*one.answer.refusal) == ofSignature;
+  };
+  const auto first = std::find_if(facts.findings.begin(), facts.findings.end(), is);
+  if (first == facts.findings.end()) return std::nullopt;
+  return Check{name, Outcome::failure, listed(facts.findings, is, labelled),
+               adviceOn(*first->answer.refusal, facts.places)};
+}
+
 bool isGenuine(const StorebagFinding& finding) {
   return finding.answer.genuine.value_or(false);
 }
@@ -175,6 +183,7 @@ Check checkStorebag(const StorebagFacts& facts, const std::string& address) {
     return {kName, Outcome::failure, labelled(last),
             fmt::format("see whether the storebag server runs and answers at {}", address)};
   }
+  if (const auto refused = checkOfRefusal(kName, facts, false)) return *refused;
   const std::string problems = listed(findings, isNoStorebag, labelled);
   if (problems.empty()) return ok(kName, fmt::format("{} fetched", findings.size()));
   const std::string mend =
@@ -209,6 +218,7 @@ Check checkSignature(const StorebagFacts& facts) {
                         "belongs to the key it is signed with",
                         bad, facts.publicKeyPath)};
   }
+  if (const auto refused = checkOfRefusal(kName, facts, true)) return *refused;
   const std::string good = listed(facts.findings, isGenuine, quoted);
   if (good.empty()) return skipped(kName, "there is no storebag to verify");
   return ok(kName, "good: " + good);
@@ -260,82 +270,6 @@ Check checkClientTypes(const StorebagFacts& facts) {
           "use a client type from 5 to 17"};
 }
 
-Check checkConsent(Consent consent) {
-  constexpr const char* kName = "consent";
-  const std::string key = config::preference::kConsent;
-  const std::string give = "veltractl config set " + key + " true";
-  switch (consent) {
-    case Consent::given:
-      return ok(kName, "given");
-    case Consent::refused:
-      return {kName, Outcome::warning,
-              "refused: " + key + " is false, so only what needs no consent is reported",
-              "the owner's choice; to change it: " + give};
-    case Consent::neverGiven:
-      return {kName, Outcome::failure,
-              "never given: " + key + " is not set, so only what needs no consent is reported", give};
-    case Consent::noBoolean:
-      return {kName, Outcome::failure, key + " is not a boolean, which counts as refused", give};
-    case Consent::policyBroken:
-      return {kName, Outcome::failure, "nothing may leave: policy.json is broken or cannot be read",
-              "correct etc/veltrad/policy.json; the daemon's log names the line and column"};
-    case Consent::reportingOff:
-      return {kName, Outcome::warning, "nothing may leave: the owner of the device has turned reporting off",
-              "the owner's choice: \"reporting\" in policy.json, or veltractl privacy on"};
-    case Consent::notKnown:
-      break;
-  }
-  return {kName, Outcome::warning, key + " cannot be read just now", "run the command again"};
-}
-
-Check checkMessageLog(const MachineFacts& facts) {
-  constexpr const char* kName = "messageLog";
-  if (facts.messageLogProblem.empty()) return ok(kName, facts.messageLogPath);
-  return {kName, Outcome::failure, facts.messageLogProblem,
-          fmt::format("make {} a directory that the daemon's user may write to, with free space",
-                      facts.messageLogPath)};
-}
-
-Check checkSandbox(const MachineFacts& facts) {
-  constexpr const char* kName = "sandbox";
-  if (facts.sandboxInForce) return ok(kName, facts.sandboxLine);
-  return {kName, Outcome::warning, facts.sandboxLine,
-          "use a kernel with Landlock (5.13 or newer, \"landlock\" in its lsm= list)"};
-}
-
-Check checkDescriptors(const MachineFacts& facts) {
-  constexpr const char* kName = "descriptors";
-  const std::string mend = fmt::format("in the unit of veltrad: LimitNOFILE={}", facts.descriptorsNeeded);
-  if (facts.descriptors < kFewestDescriptors) {
-    return {kName, Outcome::failure,
-            fmt::format("{} at most, and a daemon with a few clients needs {}", facts.descriptors,
-                        kFewestDescriptors),
-            mend};
-  }
-  if (facts.descriptors < facts.descriptorsNeeded) {
-    return {kName, Outcome::warning,
-            fmt::format("{} at most; for as many connections as are allowed it takes {}", facts.descriptors,
-                        facts.descriptorsNeeded),
-            mend};
-  }
-  return ok(kName, fmt::format("{} at most", facts.descriptors));
-}
-
-std::string dateOf(double secondsSince1970) {
-  const auto whole = static_cast<std::time_t>(secondsSince1970);
-  std::tm parts{};
-  gmtime_r(&whole, &parts);
-  return fmt::format("{:%Y-%m-%d %H:%M:%S} UTC", parts);
-}
-
-Check checkClock(double now) {
-  constexpr const char* kName = "clock";
-  if (now >= kEarliestTime) return ok(kName, dateOf(now));
-  return {kName, Outcome::failure,
-          fmt::format("{} is before this program was made, and certificates seem not valid yet", dateOf(now)),
-          "set the clock: timedatectl set-ntp true"};
-}
-
 // The checks on the way to a storebag in use.
 void diagnoseServer(const StorebagFacts& storebags, const AddressFacts& address, std::vector<Check>& checks) {
   const bool noAddress = checks.back().result == Outcome::failure || !address.inUse;
@@ -370,11 +304,7 @@ std::vector<Check> diagnose(const EntitlementFacts& entitlement, const AddressFa
   std::vector<Check> checks{checkEntitlement(entitlement), checkAddress(address)};
   diagnoseServer(storebags, address, checks);
   checks.push_back(checkClientTypes(storebags));
-  checks.push_back(checkConsent(machine.consent));
-  checks.push_back(checkMessageLog(machine));
-  checks.push_back(checkSandbox(machine));
-  checks.push_back(checkDescriptors(machine));
-  checks.push_back(checkClock(machine.now));
+  addMachineChecks(machine, checks);
   return checks;
 }
 

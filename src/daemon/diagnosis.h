@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "config/storebag_source.h"
+#include "daemon/refusal_advice.h"
 #include "ipc/entitlements.h"
 
 namespace veltrad::daemon {
@@ -55,6 +56,7 @@ struct StorebagFacts {
   const char* section = nullptr;  // that the environment names; null: none
   std::string certificatesPath;
   std::string publicKeyPath;
+  RefusalPlaces places;
   std::vector<std::int32_t> typesWithout;  // asked for, and without a storebag
 };
 

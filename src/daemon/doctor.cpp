@@ -95,6 +95,8 @@ StorebagFacts Doctor::storebags(StorebagCache& cache, const std::vector<std::int
   facts.section = config::sectionNameForEnvironment(_settings.currentEnvironment().value_or(0));
   facts.certificatesPath = _services.root.extraCertificatesPath();
   facts.publicKeyPath = _services.root.publicKeyPath();
+  facts.places = {_services.root.keysDirectory(), _services.root.settingsPath(),
+                  _services.root.seenStorebagsPath()};
   facts.typesWithout = std::move(names.typesWithout);
   const auto url = _settings.storebagServerURL();
   if (!url || config::isExampleStorebagURL(*url)) return facts;

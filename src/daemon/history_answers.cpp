@@ -15,7 +15,6 @@ namespace {
 using namespace std::chrono_literals;
 using support::HistoryFile;
 using support::HistoryFolder;
-using support::HistoryPlace;
 
 // So that an answer fits into a frame.
 constexpr std::size_t kMostRecords = 1000;

@@ -186,6 +186,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
     services.history.writeSoon();
     if (++ownerTicks < kOwnerTicks) return;
     ownerTicks = 0;
+    daemon.follower().tick();
     services.allowance.load();
     services.destinations.load();
     files.counters.writeSoon();
@@ -216,11 +217,12 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
 // Stops the listener first, so that every session sends its stop message; then finishes posts and datagrams;
 // then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
-bool stop(daemon::Services& services, ipc::Listener& listener, ipc::Listener& control,
+bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener, ipc::Listener& control,
           const StateFiles& files) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
+  daemon.follower().stop();
   std::size_t stuck = listener.invalidate(deadline - 1s);
   stuck += control.invalidate(deadline - 1s);
   services.http.drain(deadline - 500ms);
@@ -308,7 +310,7 @@ int main(int count, char** arguments) {
   const StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
   serve(services, daemon, listener, files, loop);
 
-  const bool ended = stop(services, listener, control, files);
+  const bool ended = stop(services, daemon, listener, control, files);
   if (ended && countsRecord) countsRecord->told();
   daemon.backends().sayRest();
   platform::VeltraLogging::stopLogging();

@@ -29,7 +29,7 @@ struct Observers::Question {
   Right right;
   Answer (Observers::*answer)(const Dictionary& arguments);
   // Instead, where the answer depends on who asks.
-  Answer (Observers::*answerTo)(const Dictionary& arguments, ipc::Connection& caller) = nullptr;
+  Answer (Observers::*answerTo)(const Dictionary& arguments, Desk& desk) = nullptr;
 };
 
 const Observers::Question* Observers::questionNamed(const std::string& name) {
@@ -43,6 +43,7 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kUnsetConfig, Right::control, &Observers::unsetPreference},
       {question::kRefresh, Right::control, &Observers::refresh},
       {question::kFates, Right::observe, &Observers::fates},
+      {question::kContents, Right::control, nullptr, &Observers::contents},
       {question::kPrivacy, Right::control, &Observers::privacy},
       {question::kTurnReportingOff, Right::control, &Observers::turnReportingOff},
       {question::kTurnReportingOn, Right::control, &Observers::turnReportingOn},
@@ -78,9 +79,15 @@ class Observers::Desk final : public ipc::Observer {
     return std::nullopt;
   }
 
+  ipc::Connection& connection() { return _connection; }
+  // From now on contents are kept until the connection ends.
+  void watchContents(platform::WatchedContents& contents) {
+    if (!_watch) _watch = contents.watch();
+  }
+
  private:
   Answer answered(const Question& question, const Dictionary& arguments) {
-    return question.answerTo ? (_observers.*question.answerTo)(arguments, _connection)
+    return question.answerTo ? (_observers.*question.answerTo)(arguments, *this)
                              : (_observers.*question.answer)(arguments);
   }
   bool holds(const char* entitlement) {
@@ -101,10 +108,11 @@ class Observers::Desk final : public ipc::Observer {
 
   Observers& _observers;
   ipc::Connection& _connection;
+  std::unique_ptr<platform::WatchedContents::Watch> _watch;  // null: does not watch
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
-                     Privacy& privacy, const platform::FateRing& fates, double started)
+                     Privacy& privacy, platform::FateRing& fates, double started)
     : _services(services),
       _agent(agent),
       _clients(clients),
@@ -167,7 +175,7 @@ Observers::Answer Observers::refresh(const Dictionary& arguments) {
   return refreshStorebag(_agent.storebags(), *name);
 }
 
-Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection& caller) {
+Observers::Answer Observers::doctor(const Dictionary& arguments, Desk& desk) {
   std::vector<std::int32_t> types;
   const Array* asked = arguments.array("clientTypes");
   for (const Value& value : asked ? *asked : Array()) {
@@ -175,7 +183,7 @@ Observers::Answer Observers::doctor(const Dictionary& arguments, ipc::Connection
     if (!type) return Failure{std::string("argument \"clientTypes\" must hold numbers")};
     types.push_back(*type);
   }
-  return _doctor.examine(caller, _agent.storebags(), types);
+  return _doctor.examine(desk.connection(), _agent.storebags(), types);
 }
 
 // The entries from a position on, as they lie in the ring.
@@ -192,6 +200,23 @@ Observers::Answer Observers::fates(const Dictionary& arguments) {
                     {"next", copy.next},           {"missing", copy.missing},
                     {"end", _fates.next()},        {"messages", messages},
                     {"size", _fates.size()},       {"refresh", _fates.refresh()}};
+}
+
+// What messages hold, from a position on. The first question has none: from now on.
+Observers::Answer Observers::contents(const Dictionary& arguments, Desk& desk) {
+  platform::WatchedContents& contents = _fates.contents();
+  desk.watchContents(contents);
+  const Value* from = arguments.find("from");
+  const std::uint64_t end = contents.next();
+  if (!from) return Dictionary{{"contents", Array()}, {"next", end}, {"end", end}};
+  const auto position = from->toInt64();
+  if (!position || *position < 0) return Failure{std::string("argument \"from\" must be a position")};
+  platform::WatchedContents::Copy copy = contents.copy(static_cast<std::uint64_t>(*position));
+  Array pieces;
+  for (platform::WatchedContents::Piece& piece : copy.pieces) {
+    pieces.push_back(Dictionary{{"message", piece.message}, {"contents", Data{std::move(piece.contents)}}});
+  }
+  return Dictionary{{"contents", std::move(pieces)}, {"next", copy.next}, {"end", end}};
 }
 
 Observers::Answer Observers::history(const Dictionary& arguments) {

@@ -29,7 +29,7 @@ class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
   Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
-            const platform::FateRing& fates, double started);
+            platform::FateRing& fates, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -54,8 +54,9 @@ class Observers final : public ipc::ListenerDelegate {
   Answer setPreference(const Dictionary& arguments);
   Answer unsetPreference(const Dictionary& arguments);
   Answer refresh(const Dictionary& arguments);
-  Answer doctor(const Dictionary& arguments, ipc::Connection& caller);
+  Answer doctor(const Dictionary& arguments, Desk& desk);
   Answer fates(const Dictionary& arguments);
+  Answer contents(const Dictionary& arguments, Desk& desk);
   Answer privacy(const Dictionary&) { return _privacy.show(); }
   Answer turnReportingOff(const Dictionary&) { return _privacy.turnOff(); }
   Answer turnReportingOn(const Dictionary&) { return _privacy.turnOn(); }
@@ -70,7 +71,7 @@ class Observers final : public ipc::ListenerDelegate {
   ipc::Listener& _clients;
   Doctor& _doctor;
   Privacy& _privacy;
-  const platform::FateRing& _fates;
+  platform::FateRing& _fates;
   const double _started;
   config::PreferenceEditor _preferences;
 };

@@ -20,7 +20,6 @@ namespace veltrad::daemon {
 namespace {
 
 using namespace std::chrono_literals;
-using config::OwnersWord;
 
 // The HTTP thread may be reading certificates.
 constexpr auto kHTTPPatience = 500ms;

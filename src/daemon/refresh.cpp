@@ -27,6 +27,7 @@ const char* resultOf(const config::StorebagAnswer& answer) {
     case Cause::publicKey:
     case Cause::signature:
     case Cause::content:
+    case Cause::refused:
     case Cause::noSection:
       return "refused";
     default:

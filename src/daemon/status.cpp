@@ -46,7 +46,8 @@ Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, doub
           {"state", !attempted               ? "never"
                     : record.fetchSuccessful ? "successful"
                                              : "failed"},
-          {"nextAttempt", attempted ? record.fetchTime + wait : kNotKnown}};
+          {"nextAttempt", attempted ? record.fetchTime + wait : kNotKnown},
+          {"refusal", textOrNull(record.refusal.empty() ? nullptr : &record.refusal)}};
 }
 
 Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
@@ -108,11 +109,14 @@ Dictionary statusOfDaemon(const DaemonFacts& facts) {
   for (const Limit& limit : facts.limits) {
     limits.push_back(Dictionary{{"name", limit.name}, {"used", limit.used}, {"limit", limit.limit}});
   }
-  return {{"version", kVersion},
-          {"pid", static_cast<int>(::getpid())},
-          {"uptime", facts.now - facts.started},
-          {"memory", Dictionary{{"resident", residentBytes()}}},
-          {"limits", std::move(limits)}};
+  return {
+      {"version", kVersion},
+      {"pid", static_cast<int>(::getpid())},
+      {"uptime", facts.now - facts.started},
+      {"memory", Dictionary{{"resident", residentBytes()}}},
+      {"limits", std::move(limits)},
+      {"clock", facts.now < kEarliestTime ? Value("before this program was made: no storebag expires by it")
+                                          : Value(kNotKnown)}};
 }
 
 Array statusOfStorebags(StorebagCache& cache, double now) {

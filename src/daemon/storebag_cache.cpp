@@ -24,19 +24,22 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
   if (name) {
     const Lock held(_lock);
     StorebagRecord& record = settledRecord(name);
+    const auto section = used(record);
     const CacheVerdict verdict = verdictOfRecord(record, platform::timevalToSeconds(_clock.now()));
-    if (verdict == CacheVerdict::serve) {
+    // What has expired while it was fresh is asked for again.
+    if (verdict == CacheVerdict::serve && (section || !record.data)) {
       logDebug("storebagForSession: Cached storebag found for client type %d", clientType);
-      return record.data;
+      return section;
     }
     if (verdict == CacheVerdict::wait) {
       logInfo(
           "storebagForSession: Not fetching storebag for client type %d - must wait %d seconds between "
           "attempts",
           clientType, kSecondsBetweenAttempts);
-      return record.data;
+      return section;
     }
-    lastModified = record.lastModified;
+    // What is not to be used must come whole, or not at all.
+    if (section || !record.data) lastModified = record.lastModified;
     record.beingFetched = true;
   }
   config::StorebagSectionAnswer answer = fetched(clientType, name, lastModified);
@@ -71,6 +74,27 @@ config::StorebagSectionAnswer StorebagCache::fetched(std::int32_t clientType, co
     if (name) settle(_cachedStorebags[name]);
     throw;
   }
+}
+
+StorebagCache::Standing StorebagCache::standingForClientType(std::int32_t clientType) {
+  const char* name = config::storebagNameForClientType(clientType);
+  const Lock held(_lock);
+  const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
+  if (at == _cachedStorebags.end()) return {};
+  StorebagRecord& record = at->second;
+  const CacheVerdict verdict = verdictOfRecord(record, platform::timevalToSeconds(_clock.now()));
+  auto section = used(record);
+  const bool unused = verdict == CacheVerdict::serve && record.data && !section;
+  return {record.data != nullptr, std::move(section), record.version,
+          !record.beingFetched && (verdict == CacheVerdict::fetch || unused), record.fetchTime};
+}
+
+std::optional<wire::Reason> StorebagCache::refusalForClientType(std::int32_t clientType) {
+  const char* name = config::storebagNameForClientType(clientType);
+  const Lock held(_lock);
+  const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
+  if (at == _cachedStorebags.end() || used(at->second)) return std::nullopt;
+  return at->second.data ? wire::Reason::storebag_expired : at->second.refusalReason;
 }
 
 std::optional<std::string> StorebagCache::versionForClientType(std::int32_t clientType) {
@@ -126,6 +150,14 @@ StorebagRecord& StorebagCache::settledRecord(const std::string& name) {
   return record;
 }
 
+std::shared_ptr<const config::StorebagSection> StorebagCache::used(StorebagRecord& record) const {
+  const auto why = record.data ? _source.whyNotUsed(*record.data) : std::nullopt;
+  if (why && !record.saidUnused)
+    logError("Storebag '%s' refused: %s", record.data->origin.name.c_str(), why->c_str());
+  record.saidUnused = why.has_value();
+  return why ? nullptr : record.data;
+}
+
 std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t clientType,
                                                                     StorebagRecord& record,
                                                                     config::StorebagSectionAnswer answer) {
@@ -135,7 +167,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t
     logInfo(
         "fetchAndCacheStorebag: No attempt for client type %d: the daemon is short of something, or stopping",
         clientType);
-    return record.data || answer.kind != Kind::fetched ? record.data : answer.section;
+    return record.data || answer.kind != Kind::fetched ? used(record) : answer.section;
   }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
   record.fetchSuccessful = answer.kind != Kind::failed;
@@ -149,7 +181,9 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t
   record.maxAge = answer.maxAge;
   if (answer.lastModified) record.lastModified = std::move(answer.lastModified);
   record.attempted = true;
-  return record.data;
+  record.refusalReason = answer.refusal;
+  record.refusal = answer.refusal ? std::move(answer.why) : std::string();
+  return used(record);
 }
 
 }  // namespace veltrad::daemon

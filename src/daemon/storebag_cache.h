@@ -26,6 +26,11 @@ struct StorebagRecord {
   // In seconds.
   std::int32_t maxAge = 0;
   std::optional<std::string> lastModified;
+  // Why the last attempt's storebag was refused by a rule of the operator; empty: it was not.
+  std::string refusal;
+  std::optional<wire::Reason> refusalReason;
+  // It was logged that the section is not to be used any more.
+  bool saidUnused = false;
   // A first attempt has ended.
   bool attempted = false;
   // What an earlier daemon has kept was looked at.
@@ -53,6 +58,18 @@ class StorebagCache {
   // condition, and takes the answer into the record as ever. May wait as above, and then for the server.
   config::StorebagAnswer refresh(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
+  // What a session of the client type would get without a download.
+  struct Standing {
+    bool known = false;                                      // a section was fetched
+    std::shared_ptr<const config::StorebagSection> section;  // null: none that may be used
+    std::optional<std::string> version;
+    bool due = false;  // a download is
+    double fetchTime = 0;
+  };
+  Standing standingForClientType(std::int32_t clientType);
+  // The rule for which there is nothing to use; nothing: there is, or it was never fetched, or for another
+  // reason.
+  std::optional<wire::Reason> refusalForClientType(std::int32_t clientType);
   // By name; a record being fetched is as its last attempt left it.
   std::map<std::string, StorebagRecord> records();
 
@@ -65,6 +82,8 @@ class StorebagCache {
   void settle(StorebagRecord& record) REQUIRES(_lock);
   // Waits until the record of this name is not being fetched.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
+  // The record's section, unless it is not to be used any more.
+  std::shared_ptr<const config::StorebagSection> used(StorebagRecord& record) const REQUIRES(_lock);
   // Takes an answer into the record and returns what the session gets.
   std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,
                                                        config::StorebagSectionAnswer answer) REQUIRES(_lock);

@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 
+#include "config/client_types.h"
 #include "platform/log.h"
 #include "wire/constants.h"
 
@@ -72,6 +73,28 @@ std::shared_ptr<const config::StorebagSection> VeltradAgent::storebagForSession(
   logDebug("storebagForSession: Retrieving storebag for session %u with client type %d", session.sessionID(),
            clientType);
   return _cachedStorebags.storebagForClientType(clientType);
+}
+
+std::optional<session::StorebagNow> VeltradAgent::storebagNow(const session::VeltradSession& session) {
+  auto standing = _cachedStorebags.standingForClientType(session.clientType().value_or(0));
+  if (!standing.known) return std::nullopt;
+  return session::StorebagNow{std::move(standing.section), std::move(standing.version)};
+}
+
+wire::Reason VeltradAgent::reasonBehind(const session::VeltradSession& session, wire::Reason why) {
+  if (why != wire::Reason::no_backends && why != wire::Reason::no_storebag) return why;
+  return _cachedStorebags.refusalForClientType(session.clientType().value_or(0)).value_or(why);
+}
+
+VeltradAgent::Followers VeltradAgent::followers() const {
+  Followers followers;
+  for (ListedSession& listed : _sessionList.all()) {
+    const Dictionary* info = listed.facts.sessionInfo.get();
+    const auto type = info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
+    const char* name = type ? config::storebagNameForClientType(*type) : nullptr;
+    if (name) followers[name].push_back(std::move(listed));
+  }
+  return followers;
 }
 
 std::optional<std::string> VeltradAgent::storebagVersionForSession(const session::VeltradSession& session) {

@@ -3,8 +3,11 @@
 // thread.
 #pragma once
 
+#include <map>
 #include <memory>
+#include <optional>
 #include <string>
+#include <vector>
 
 #include "daemon/families.h"
 #include "daemon/session_list.h"
@@ -28,6 +31,8 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   std::shared_ptr<const config::StorebagSection> storebagForSession(
       const session::VeltradSession& session) override;
   std::optional<std::string> storebagVersionForSession(const session::VeltradSession& session) override;
+  wire::Reason reasonBehind(const session::VeltradSession& session, wire::Reason why) override;
+  std::optional<session::StorebagNow> storebagNow(const session::VeltradSession& session) override;
   void sessionInfoUpdated(session::FamilyFacts facts) override {
     _sessionList.tell(facts);
     _families.sessionInfoUpdated(std::move(facts));
@@ -50,6 +55,9 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   // Tells the back ends of all sessions what the owner's word is now; those that may not report drop what
   // waits.
   void tellOwnersWord(const config::OwnersWord& word);
+  // The open sessions by the name of their storebag; those that have none are left out.
+  using Followers = std::map<std::string, std::vector<ListedSession>>;
+  Followers followers() const;
   // Drops what waits in the back ends of all sessions and bears the device's identifier.
   void dropIdentified();
   std::size_t sessionCount() const { return _sessionList.size(); }

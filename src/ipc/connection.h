@@ -21,7 +21,8 @@ class Listener;
 class Observer;
 
 // The delegate sets it up in its listener() call and then calls resume(). After that the connection's own
-// thread reads frames and runs calls and handlers, one at a time. Any thread may call sendEvent().
+// thread reads frames and runs calls and handlers, one at a time. Any thread may call sendEvent() and
+// nudge().
 class Connection {
  public:
   virtual ~Connection() = default;
@@ -43,6 +44,9 @@ class Connection {
   // connection.
   virtual void refuse(const std::string& description) = 0;
 
+  // Has the session's takeNews() called on the connection's own thread, between two calls and soon. Takes
+  // only leaf locks.
+  virtual void nudge() {}
   // Sends a frame of client_events.h. Never blocks, and takes only leaf locks. Returns why the frame was
   // dropped, if it was.
   virtual std::optional<std::string> sendEvent(std::string_view frame) = 0;

@@ -149,6 +149,11 @@ void OutQueue::requestEnd() {
   wake();
 }
 
+void OutQueue::wakeReader() {
+  Lock lock(_mutex);
+  wake();
+}
+
 void OutQueue::stopReading() {
   Lock lock(_mutex);
   if (_socket.isOpen()) ::shutdown(_socket.get(), SHUT_RD);

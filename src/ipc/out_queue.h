@@ -50,6 +50,8 @@ class OutQueue {
   // Asks the connection's thread to end the connection after its current call.
   void requestEnd();
   bool endRequested() const { return _endRequested.load(std::memory_order_relaxed); }
+  // Wakes the connection's thread.
+  void wakeReader();
   // The client cannot send any more; what it sent before can still be read. Wakes the connection's thread.
   void stopReading();
 

@@ -63,6 +63,22 @@ std::optional<std::string> SocketConnection::sendEvent(std::string_view frame) {
   return ipc::sendEvent(*_out, frame);
 }
 
+void SocketConnection::nudge() {
+  _nudged.store(true, std::memory_order_release);
+  _out->wakeReader();
+}
+
+// Without memory it is tried again before the next call.
+void SocketConnection::takeNews() {
+  if (!_nudged.load(std::memory_order_relaxed) || !_session) return;
+  _nudged.exchange(false, std::memory_order_acquire);
+  try {
+    _session->takeNews();
+  } catch (const std::bad_alloc&) {
+    _nudged.store(true, std::memory_order_relaxed);
+  }
+}
+
 void SocketConnection::run() {
   // A delegate that accepted without resume(), a session or an observer has nothing that could serve the
   // client.
@@ -100,6 +116,7 @@ void SocketConnection::serve() {
 bool SocketConnection::runFrames() {
   wire::Frame frame;
   while (!_out->endRequested() && !overdue()) {
+    takeNews();
     if (_out->waitingBytes() > kOutQueueHighWater && !_stopping.load(std::memory_order_acquire)) {
       waitForClientToRead();
       continue;
@@ -131,6 +148,7 @@ bool SocketConnection::receive() {
     } else {
       waitForBytes();
     }
+    takeNews();
     if (_out->endRequested() || overdue()) return false;
     switch (_reader.receive(_out->socket())) {
       case SocketReader::Got::bytes:

@@ -21,10 +21,10 @@ namespace veltrad::ipc {
 
 // Reads frames, runs the calls in them one at a time on the exported session, and ends the session when the
 // client has gone. The connection's own thread runs run(), and in it every call and handler; any thread may
-// call stop() and sendEvent(). Entitlements, lent files and counters must outlive it. A session and its
-// connection hold each other until run() returns.
+// call stop(), nudge() and sendEvent(). Entitlements, lent files and counters must outlive it. A session and
+// its connection hold each other until run() returns.
 //
-// Its 19 fields are the services that a call needs, what the delegate has set, and the state of the
+// Its 20 fields are the services that a call needs, what the delegate has set, and the state of the
 // conversation.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:
@@ -62,6 +62,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
     _invalidationHandler = std::move(handler);
   }
   void resume() override { _resumed = true; }
+  void nudge() override;
   std::optional<std::string> sendEvent(std::string_view frame) override;
 
  private:
@@ -72,6 +73,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   std::optional<std::string> dispatch(const wire::Frame& frame, const std::string& extensionToken = {});
   bool greet(const wire::Frame& frame);
   bool receive();
+  void takeNews();
   bool waitForRoom();
   void waitForClientToRead();
   void waitForBytes();
@@ -106,6 +108,7 @@ class SocketConnection final : public Connection, public std::enable_shared_from
   bool _ended = false;
   std::optional<std::chrono::steady_clock::time_point> _lackingRoomSince;
 
+  std::atomic<bool> _nudged{false};
   std::atomic<bool> _stopping{false};
   std::atomic<std::chrono::steady_clock::rep> _deadline{
       std::chrono::steady_clock::time_point::max().time_since_epoch().count()};

@@ -28,6 +28,13 @@ class FatePen {
     return _ring ? FateRing::refTo(_ring->intern(text)) : wire::FateRef{0};
   }
 
+  // The same for a text that is often named: `position` is where it stands, 0 at first.
+  wire::FateRef textOf(std::string_view text, std::uint64_t& position) const {
+    if (!_ring) return 0;
+    if (!_ring->fresh(position)) position = _ring->intern(text);
+    return FateRing::refTo(position);
+  }
+
   // `entry` says of which message, batch or post, and what else is known; 0 as its time stands for now.
   void write(wire::Step step, std::optional<wire::Reason> reason, wire::StepEntry entry) const {
     if (!_ring) return;

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // The record of fates: what was decided for messages and what became of them, in a ring of fixed size. Any
-// thread, without locks, and nothing is allocated after construction.
+// thread, without locks, and nothing is allocated after construction, but for contents while somebody
+// watches.
 #pragma once
 
 #include <atomic>
@@ -13,6 +14,7 @@
 #include <string_view>
 
 #include "platform/clock.h"
+#include "platform/watched_contents.h"
 #include "wire/fate_entries.h"
 
 namespace veltrad::platform {
@@ -68,6 +70,8 @@ class FateRing {
   std::uint64_t next() const { return _next.load(std::memory_order_acquire); }
   std::size_t size() const { return _size; }
   std::size_t refresh() const { return _refresh; }
+  // What the messages hold, which is not in the record.
+  WatchedContents& contents() { return _contents; }
 
  private:
   // Of the table that finds texts again.
@@ -98,6 +102,7 @@ class FateRing {
   const std::unique_ptr<std::uint64_t[], Free> _memory;
   std::uint64_t* const _slots;
   std::uint64_t* const _texts;
+  WatchedContents _contents;
 
   alignas(64) std::atomic<std::uint64_t> _next{1};
   std::atomic<std::uint64_t> _messages{0};

@@ -77,7 +77,7 @@ Result<Done, std::string> FilePreferences::change(std::string_view domain, std::
 Result<Done, std::string> FilePreferences::edit(std::string_view domain, std::string_view what,
                                                 const Edit& edit) {
   Complaints complaints;
-  const auto changed = [&]() -> Result<Done, std::string> {
+  auto changed = [&]() -> Result<Done, std::string> {
     Lock lock(_mutex);
     auto written = write(domain, what, edit, complaints);
     if (written) _unstored = {};
@@ -89,7 +89,7 @@ Result<Done, std::string> FilePreferences::edit(std::string_view domain, std::st
 
 Result<Dictionary, FileFailure> FilePreferences::all(std::string_view domain) {
   Complaints complaints;
-  const auto found = [&] {
+  auto found = [&] {
     Lock lock(_mutex);
     return known(domain, complaints);
   }();

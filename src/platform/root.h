@@ -34,6 +34,8 @@ class Root {
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }
+  // Serials and revocations of storebags.
+  std::string seenStorebagsPath() const { return path("var/lib/veltrad/seen-storebags.json"); }
   std::string metricsPath() const { return path("run/veltrad/metrics.prom"); }
   std::string preferencesDirectory() const { return path("var/lib/veltrad/preferences"); }
   std::string logsDirectory() const { return path("var/log/veltrad"); }
@@ -47,6 +49,8 @@ class Root {
   std::string deploymentPath() const { return path("etc/veltrad/deployment.plist"); }
   std::string settingsPath() const { return path("etc/veltrad/settings.json"); }
   std::string policyPath() const { return path("etc/veltrad/policy.json"); }
+  // Further public keys of storebags.
+  std::string keysDirectory() const { return path("etc/veltrad/keys"); }
   std::string extraCertificatesPath() const { return path("etc/veltrad/ca.pem"); }
   std::string localeConfigurationPath() const { return path("etc/locale.conf"); }
   std::string resourcesDirectory() const { return path("usr/share/veltra"); }

@@ -37,6 +37,11 @@ std::optional<std::string> Aggregation::lineOf(const std::string& failure) {
   return _dropLine.happened("sendMessageWithDictionary: Failed to get remote object proxy: " + failure);
 }
 
+void Aggregation::nudge() {
+  const Lock held(_mutex);
+  if (_connection) _connection->nudge();
+}
+
 std::optional<std::string> Aggregation::end() {
   // Possibly the last reference, released after the lock.
   std::shared_ptr<ipc::Connection> connection;

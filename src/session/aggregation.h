@@ -38,6 +38,8 @@ class Aggregation {
   CopySent sendToAggregator(std::string_view copy, const std::string& session);
   // Stops aggregating. If it was active, tells the client that no more copies follow.
   [[nodiscard]] std::optional<std::string> shutdownSessionAggregation(std::uint32_t sessionID);
+  // Has the session take news, on its own thread.
+  void nudge();
   // Releases the connection.
   [[nodiscard]] std::optional<std::string> end();
 

@@ -12,6 +12,12 @@ namespace veltrad::session {
 
 namespace {
 constexpr double kNoVersion = std::numeric_limits<double>::quiet_NaN();
+
+// The back end of this name; null: there is none.
+backends::VeltraBackend* named(const BackendSet* set, const std::string& name) {
+  const auto at = set ? set->find(name) : BackendSet::const_iterator();
+  return set && at != set->end() ? at->second.get() : nullptr;
+}
 }  // namespace
 
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
@@ -26,7 +32,9 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
     logError("createBackends: Attempted to create backends with nil session info");
     return nullptr;
   }
-  facts.startTimeStamp = platform::timevalToSeconds(making.clock.now());
+  facts.startTimeStamp = making.before && !making.before->empty()
+                             ? making.before->begin()->second->facts()->startTimeStamp
+                             : platform::timevalToSeconds(making.clock.now());
   facts.device.productVersion = making.device.deviceProductVersion();
   facts.device.buildVersion = making.device.deviceBuildVersion();
   facts.device.hardwareType = making.device.deviceProductType();
@@ -57,7 +65,10 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
       notMade(name, wire::Reason::policy_backends);
       continue;
     }
-    auto backend = making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot);
+    backends::VeltraBackend* before = named(making.before, name);
+    auto backend =
+        making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot,
+                                          before ? std::optional(before->samplingFactor()) : std::nullopt);
     if (!backend) {
       notMade(name, backends::BackendFactory::whyNotMade(name));
       continue;
@@ -69,9 +80,20 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
       backend->cleanup();
       continue;
     }
+    if (before) backend->takeOver(*before);
     made->emplace(name, std::move(backend));
   }
   return made;
+}
+
+void updateStates(const BackendSet* backends) {
+  if (!backends) return;
+  for (const auto& [name, backend] : *backends) backend->updateState();
+}
+
+void cleanUp(const BackendSet* backends) {
+  if (!backends) return;
+  for (const auto& [name, backend] : *backends) backend->cleanup();
 }
 
 void forbidByWord(const BackendSet& backends, const config::OwnersWord& word) {

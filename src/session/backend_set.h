@@ -39,6 +39,8 @@ struct BackendMaking {
   bool oneShot = false;
   // Gets those that were not made, unless it is null.
   NotMade* notMade = nullptr;
+  // Those that the new ones take over from, by name; null: none.
+  const BackendSet* before = nullptr;
 };
 
 // Makes a back end for each entry of the section that the factory knows and the owner of the device allows;
@@ -48,6 +50,12 @@ struct BackendMaking {
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
+
+// Has each decide on its state. The set may be null, here and below.
+void updateStates(const BackendSet* backends);
+
+// Called before the session releases the back ends.
+void cleanUp(const BackendSet* backends);
 
 // Tells the back ends what the owner's word is now. The session's thread.
 void forbidByWord(const BackendSet& backends, const config::OwnersWord& word);

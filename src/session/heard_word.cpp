@@ -24,7 +24,7 @@ void HeardWord::takeIdentity(support::DeviceIdentity& device, char (&deviceID)[4
   }
 }
 
-backends::UserInfo HeardWord::allowed(backends::SharedDictionary userInfo) const {
+backends::UserInfo HeardWord::allowed(const backends::SharedDictionary& userInfo) const {
   backends::UserInfo info{userInfo, userInfo, nullptr};
   if (!userInfo || !_word->fields) return info;
   Dictionary sent = *userInfo;

@@ -26,7 +26,7 @@ class HeardWord {
   void takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41], const BackendSet* set) const;
   // With what of it may leave: null stays null, and what holds nothing that the owner keeps back the same
   // object.
-  backends::UserInfo allowed(backends::SharedDictionary userInfo) const;
+  backends::UserInfo allowed(const backends::SharedDictionary& userInfo) const;
   // Take out what the owner keeps back, and say what that was.
   config::EditedFields restrict(std::optional<Dictionary>& payload) const;
   config::EditedFields restrict(Array& logData) const;

@@ -34,6 +34,12 @@ struct FamilyPlace {
   std::int32_t hierarchy;
 };
 
+// What a session that follows its storebag is to have.
+struct StorebagNow {
+  std::shared_ptr<const config::StorebagSection> section;  // null: nothing that may be used
+  std::optional<std::string> version;
+};
+
 class VeltradSessionDelegate {
  public:
   virtual ~VeltradSessionDelegate() = default;
@@ -43,6 +49,12 @@ class VeltradSessionDelegate {
       const VeltradSession& session) = 0;
   // Never downloads.
   virtual std::optional<std::string> storebagVersionForSession(const VeltradSession& session) = 0;
+
+  // What the daemon holds for the session now; nothing: the session keeps what it has. Never downloads.
+  virtual std::optional<StorebagNow> storebagNow(const VeltradSession&) { return std::nullopt; }
+
+  // What is behind a message's want of back ends, if it is the refusal of a storebag; else `why` itself.
+  virtual wire::Reason reasonBehind(const VeltradSession&, wire::Reason why) { return why; }
 
   // Updates the facts of a session that is in a family.
   virtual void sessionInfoUpdated(FamilyFacts facts) = 0;

@@ -21,6 +21,7 @@ NotMade* SessionFates::comesFrom(const config::StorebagOrigin& origin,
 void SessionFates::describe(const FamilyFacts& facts, From from) {
   using Entry = wire::SessionEntry;
   if (!_pen.writes()) return;
+  _sentUserInfo = facts.sentUserInfo;
   Entry entry;
   if (const Dictionary* info = (_sessionInfo ? _sessionInfo : facts.sessionInfo).get()) {
     const auto take = [&entry](auto& into, const auto& value, Entry::Known known) {
@@ -66,6 +67,8 @@ void SessionFates::taken(Message& message, From from, const config::EditedFields
   if (reason) entry.reason = static_cast<std::uint8_t>(*reason);
   if (reason == wire::Reason::no_category) entry.known = 0;
   if (reason == wire::Reason::no_type) entry.known = wire::MessageEntry::categoryKnown;
+  _pen.ring()->contents().keep(entry.message, message.payload ? &*message.payload : nullptr,
+                               _sentUserInfo.get());
   _pen.ring()->write(entry);
   message.note.number = entry.message;
   message.note.session = entry.session;

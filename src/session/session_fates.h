@@ -37,8 +37,8 @@ class SessionFates {
   // `from` says whether the facts are those of a message without a session of its own.
   void describe(const FamilyFacts& facts, From from);
 
-  // Sets the message's note; `edits` is what the owner keeps back of its payload. Without `edits` it reached
-  // no back end, for `reason`. The time of a message that has none is now.
+  // Sets the message's note; `edits` is what the owner keeps back of its payload, which the payload no longer
+  // holds. Without `edits` it reached no back end, for `reason`. The time of a message that has none is now.
   void taken(Message& message, From from, const config::EditedFields* edits,
              std::optional<wire::Reason> reason = std::nullopt);
   // It reached no back end.
@@ -54,6 +54,7 @@ class SessionFates {
   std::uint64_t _session = 0;
   config::StorebagOrigin _origin;
   backends::SharedDictionary _sessionInfo;  // null before there are back ends
+  backends::SharedDictionary _sentUserInfo;
   NotMade _notMade;
 };
 

@@ -104,15 +104,15 @@ void VeltradSession::hearOwner() {
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
   logDebug("startConfigWithCompletionHandler: Starting configuration for session %u", _sessionID);
-  const auto storebag = _sessionDelegate.storebagForSession(*this);
+  auto storebag = _sessionDelegate.storebagForSession(*this);
   hearOwner();
   if (!storebag) {
     _services.counters.count(wire::Reason::start_without_storebag);
     if (completionHandler) completionHandler(std::nullopt);
     return;
   }
-  _storebagVersion = _sessionDelegate.storebagVersionForSession(*this);
-  createBackendsWithStorebag(*storebag);
+  _storebag.give(std::move(storebag), _sessionDelegate.storebagVersionForSession(*this));
+  createBackends(nullptr);
   updateSessionWithDefaultSessionInfo();
   hearOwner();
   internalSendMessage(
@@ -121,7 +121,15 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& storebag) {
+void VeltradSession::takeNews() {
+  hearOwner();
+  auto now = _backends ? _sessionDelegate.storebagNow(*this) : std::nullopt;
+  if (!now || !_storebag.follow(std::move(*now), _sessionID)) return;
+  createBackends(_backends.get());
+  updateSessionWithDefaultSessionInfo();
+}
+
+void VeltradSession::createBackends(const BackendSet* before) {
   logDebug("createBackendsWithStorebag: Creating backends for session %u", _sessionID);
   // It may not have been available when the client connected.
   if (_deviceid[0] == '\0') _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
@@ -129,22 +137,18 @@ void VeltradSession::createBackendsWithStorebag(const config::StorebagSection& s
   facts.device.udid = _deviceid;
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
-  auto made = createBackends(
+  const config::StorebagSection& storebag = _storebag.section();
+  auto made = session::createBackends(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo)},
+       _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo), before},
       &storebag, _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
-  // Clean up the back ends that a second start has replaced.
-  if (made) {
-    for (const auto& [name, backend] : *made) backend->cleanup();
-  }
+  cleanUp(made.get());  // those that were replaced
 }
 
 void VeltradSession::updateSessionWithDefaultSessionInfo() {
   _sessionDelegate.userInfoUpdatedForSession(familyFacts());
-  if (_backends) {
-    for (const auto& [name, backend] : *_backends) backend->updateState();
-  }
+  updateStates(_backends.get());
   _sessionDelegate.updateDownstreamSessions(familyFacts());
   // After the daemon knows the back ends, so that it tells them of any later word.
   if (_backends) forbidByWord(*_backends, _word.now());
@@ -244,9 +248,12 @@ bool VeltradSession::hasBackends(Message& message, Origin origin) {
   return false;
 }
 
-std::nullopt_t VeltradSession::refused(Message message, wire::Reason why) {
+std::nullopt_t VeltradSession::refused(Message message, wire::Reason why, SessionFates* oneShot) {
   _services.counters.count(why);
-  _fates.refused(familyFacts(), std::move(message), Origin::client, why);
+  static_cast<void>(_word.restrict(message.payload));
+  (oneShot ? *oneShot : _fates)
+      .refused(familyFacts(), std::move(message), oneShot ? Origin::oneShot : Origin::client,
+               _sessionDelegate.reasonBehind(*this, why));
   return std::nullopt;
 }
 
@@ -319,8 +326,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   SessionFates fates(_services.fates);
   Message message{std::move(payload), {}, category, type, 0};
   const auto refuse = [&](wire::Reason why) {
-    _services.counters.count(why);
-    fates.refused(familyFacts(), std::move(message), Origin::oneShot, why);
+    hearOwner();
+    static_cast<void>(refused(std::move(message), why, &fates));
   };
   if (!info || !info->int32(wire::kVeltraSessionInfoClientType) ||
       !info->uint32(wire::kVeltraSessionInfoSessionID)) {
@@ -330,9 +337,8 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
   backends::SharedDictionary kept;
   backends::SharedDictionary identity;
-  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity)) {
+  if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity))
     return refuse(wire::Reason::message_over_share);
-  }
   _sessionInfo = kept;
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
@@ -359,7 +365,7 @@ void VeltradSession::end() {
   logDebug("dealloc: VeltradSession dealloc: %u", _sessionID);
   _leftFamily = true;
   Dictionary payload;
-  payload.setIfPresent("StorebagVersion", _storebagVersion);
+  payload.setIfPresent("StorebagVersion", _storebag.version());
   internalSendMessage(payload, 0, 1);
   flushMessagesWithCompletion(nullptr);
   if (const auto line = _aggregation->shutdownSessionAggregation(_sessionID)) logError("%s", line->c_str());
@@ -368,10 +374,8 @@ void VeltradSession::end() {
   const auto released = std::exchange(_backends, nullptr);
   _sessionInfo = nullptr;
   _userInfo = {};
-  _storebagVersion = std::nullopt;
-  if (released) {
-    for (const auto& [name, backend] : *released) backend->cleanup();
-  }
+  _storebag.forget();
+  cleanUp(released.get());
 }
 
 }  // namespace veltrad::session

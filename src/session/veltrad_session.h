@@ -18,6 +18,7 @@
 #include "platform/memory_budget.h"
 #include "platform/preferences.h"
 #include "session/backend_set.h"
+#include "session/given_storebag.h"
 #include "session/heard_word.h"
 #include "session/session_fates.h"
 #include "support/message_log.h"
@@ -72,6 +73,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void sendMessageWithSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                   std::uint16_t category, std::uint16_t type,
                                   wire::OptionalDictionary payload, wire::SentReply reply) override;
+  // Goes on with the storebag that the daemon holds now, if sessions follow theirs.
+  void takeNews() override;
   // Sends the stop message, flushes, and cleans up and releases the back ends.
   void end() override;
   std::string description() const override;
@@ -87,7 +90,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
 
   // Takes the owner's word over if it has changed, also into the back ends.
   void hearOwner();
-  void createBackendsWithStorebag(const config::StorebagSection& storebag);
+  // From the storebag that was given. Those in `before`, if it is not null, are taken over from.
+  void createBackends(const BackendSet* before);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
   void receivedUserInfo(backends::SharedDictionary userInfo);
@@ -110,7 +114,8 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // The record of fates, which knows what the session is.
   SessionFates& fates();
   // Counts and records why the client's message reaches no back end. Returns nothing.
-  std::nullopt_t refused(Message message, wire::Reason why);
+  // `oneShot`: the record of a message without a session; null for one of the session.
+  std::nullopt_t refused(Message message, wire::Reason why, SessionFates* oneShot = nullptr);
   void sayWithoutUserInfo();
   void internalSendMessage(const Dictionary& payload, std::uint16_t method, std::uint16_t respCode);
 
@@ -136,7 +141,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // It must not join its family again.
   bool _leftFamily = false;
   std::shared_ptr<const BackendSet> _backends;
-  std::optional<std::string> _storebagVersion;
+  GivenStorebag _storebag;
 };
 
 }  // namespace veltrad::session

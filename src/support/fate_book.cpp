@@ -10,11 +10,6 @@ namespace {
 using wire::Fate;
 using wire::Step;
 
-std::optional<wire::Reason> reasonOf(const wire::StepEntry& entry) {
-  if (entry.reason == wire::kNoReason) return std::nullopt;
-  return static_cast<wire::Reason>(entry.reason);
-}
-
 // The fate that a step means by itself.
 std::optional<Fate> fateAfter(const wire::StepEntry& entry) {
   const bool dashboard = entry.backend == wire::numberOfBackend(wire::kVeltraBackendDashboard);
@@ -69,7 +64,7 @@ void takeStep(BackendFate& fate, const ToldStep& step) {
   takeNames(fate, step);
   if (step.standing) {
     fate.standing = step.standing;
-    fate.eventNumber = entry.eventNumber;
+    if ((step.message & wire::kNoMessage) == 0) fate.eventNumber = entry.eventNumber;
   }
   if (entry.batch != 0) fate.batch = entry.batch;
   if (entry.post != 0) fate.post = entry.post;
@@ -80,7 +75,7 @@ void takeStep(BackendFate& fate, const ToldStep& step) {
   if (entry.step == Step::answered) fate.status = entry.status;
   if (const auto now = fateAfter(entry)) {
     fate.fate = *now;
-    const auto reason = reasonOf(entry);
+    const auto reason = wire::reasonIn(entry.reason);
     fate.reason = saysNothing(reason) ? std::nullopt : reason;
     if (now == Fate::held && fate.standing) fate.reason = static_cast<wire::Reason>(fate.standing->reason);
   }

@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <utility>
 
 #include "formats/json.h"
 
@@ -33,8 +34,10 @@ std::uint32_t historyCRC(std::uint32_t crc, std::string_view bytes) {
       crc32_z(crc, reinterpret_cast<const unsigned char*>(bytes.data()), bytes.size()));
 }
 
-HistoryFile::HistoryFile(const std::string& path) {
-  _file.reset(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+HistoryFile::HistoryFile(const std::string& path)
+    : HistoryFile(FileDescriptor(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC))) {}
+
+HistoryFile::HistoryFile(FileDescriptor file) : _file(std::move(file)) {
   struct stat status {};
   if (_file.isOpen() && ::fstat(_file.get(), &status) == 0 && S_ISREG(status.st_mode))
     _size = static_cast<std::uint64_t>(status.st_size);

@@ -35,6 +35,7 @@ class HistoryFile {
  public:
   // One that cannot be opened has no records.
   explicit HistoryFile(const std::string& path);
+  explicit HistoryFile(FileDescriptor file);
 
   std::uint64_t size() const { return _size; }
   int descriptor() const { return _file.get(); }

@@ -6,14 +6,15 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
+#include <sys/uio.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <cstring>
-#include <ctime>
 #include <vector>
 
 #include "base/file_descriptor.h"
@@ -27,11 +28,16 @@ namespace veltrad::support {
 namespace {
 constexpr double kExpirySeconds = 86'400;
 constexpr std::size_t kLineBytes = 128;  // the memory of a waiting line besides its text
+constexpr std::size_t kMostAtOnce = 64;  // lines in one call
 constexpr std::string_view kPrefix = "veltrad_";
 constexpr std::string_view kSuffix = "_messageLog.diag";
 
 double secondsOf(const struct statx_timestamp& time) {
   return static_cast<double>(time.tv_sec) + time.tv_nsec / 1e9;
+}
+
+std::size_t memoryOf(const std::string& line) {
+  return line.size() + kLineBytes;
 }
 
 // The part between the underscores of a log file's name; absent for any other name.
@@ -77,13 +83,25 @@ std::string createdText(const std::optional<double>& created) {
 }
 }  // namespace
 
+// By hand, because strftime() takes as long as the rest of a line.
 std::string dateDescription(double secondsSince1970) {
-  const auto whole = static_cast<std::time_t>(std::floor(secondsSince1970));
-  struct tm parts {};
-  gmtime_r(&whole, &parts);
-  char text[32];
-  const std::size_t length = strftime(text, sizeof text, "%Y-%m-%d %H:%M:%S +0000", &parts);
-  return {text, length};
+  const std::chrono::sys_seconds time{
+      std::chrono::seconds(static_cast<long long>(std::floor(secondsSince1970)))};
+  const auto day = std::chrono::floor<std::chrono::days>(time);
+  const std::chrono::year_month_day date(day);
+  const std::chrono::hh_mm_ss clock(time - day);
+  std::string text = std::to_string(int{date.year()});
+  const auto append = [&text](char before, auto number) {
+    const auto two = static_cast<unsigned>(number);
+    const char digits[] = {before, static_cast<char>('0' + two / 10), static_cast<char>('0' + two % 10)};
+    text.append(digits, sizeof digits);
+  };
+  append('-', unsigned{date.month()});
+  append('-', unsigned{date.day()});
+  append(' ', clock.hours().count());
+  append(':', clock.minutes().count());
+  append(':', clock.seconds().count());
+  return text.append(" +0000");
 }
 
 MessageLog::MessageLog(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer,
@@ -101,34 +119,66 @@ void MessageLog::put(std::string_view format, std::initializer_list<std::string_
   line.append("(").append(dateDescription(now)).append(") ");
   appendFilled(line, format, values);
   line.push_back('\n');
-  const std::size_t bytes = line.size() + kLineBytes;
-  using Put = platform::DiskWriter::Queue::Put;
-  switch (_queue.put(
-      [this, line = std::move(line)] {
-        if (!append(line)) _counters.count(wire::Reason::log_line_disk);
-      },
-      bytes)) {
-    case Put::taken:
-      return;
-    case Put::full:
+  const std::size_t bytes = memoryOf(line);
+  {
+    const Lock held(_mutex);
+    if (_bytes > 0 && (bytes > kMostBytes || _bytes > kMostBytes - bytes))
       return _counters.count(wire::Reason::log_line_queue_full);
-    case Put::noThread:
-      return _counters.count(wire::Reason::log_line_no_thread);
+    _bytes += bytes;
+    _waiting.push_back(std::move(line));
+    if (_waiting.size() > 1) return;
   }
+  using Put = platform::DiskWriter::Queue::Put;
+  const Put put = _queue.put([this] { writeWaiting(); }, 1);
+  if (put == Put::taken) return;
+  // Nobody will take them.
+  const auto lost = takeWaiting();
+  _counters.count(put == Put::full ? wire::Reason::log_line_queue_full : wire::Reason::log_line_no_thread,
+                  lost.size());
+  end(lost);
 }
 
-bool MessageLog::append(const std::string& line) {
+std::vector<std::string> MessageLog::takeWaiting() {
+  std::vector<std::string> lines;
+  const Lock held(_mutex);
+  lines.swap(_waiting);
+  return lines;
+}
+
+void MessageLog::end(const std::vector<std::string>& lines) {
+  const Lock held(_mutex);
+  for (const std::string& line : lines) _bytes -= memoryOf(line);
+}
+
+void MessageLog::writeWaiting() {
+  const std::vector<std::string> lines = takeWaiting();
+  for (std::span<const std::string> left = lines; !left.empty();) {
+    const auto some = left.first(std::min(left.size(), kMostAtOnce));
+    if (!append(some)) _counters.count(wire::Reason::log_line_disk, some.size());
+    left = left.subspan(some.size());
+  }
+  end(lines);
+}
+
+bool MessageLog::append(std::span<const std::string> lines) {
   auto file = newestSurvivor();
   if (!file) file = createFile();
   if (!file) return false;
   // Neither follows a link nor blocks.
   const FileDescriptor opened(
       open(file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  if (write(opened.get(), line.data(), line.size()) != static_cast<ssize_t>(line.size())) {
+  iovec pieces[kMostAtOnce];
+  std::size_t bytes = 0;
+  for (std::size_t i = 0; i < lines.size(); ++i) {
+    pieces[i] = {const_cast<char*>(lines[i].data()), lines[i].size()};
+    bytes += lines[i].size();
+  }
+  if (writev(opened.get(), pieces, static_cast<int>(lines.size())) != static_cast<ssize_t>(bytes)) {
     remove(*file);
     return false;
   }
-  logInfo("writeToLogFile: Saved log message to %s", file->path.c_str());
+  for (std::size_t i = 0; i < lines.size(); ++i)
+    logInfo("writeToLogFile: Saved log message to %s", file->path.c_str());
   return true;
 }
 

@@ -5,9 +5,12 @@
 #include <cstddef>
 #include <initializer_list>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
+#include <vector>
 
+#include "base/mutex.h"
 #include "platform/disk_writer.h"
 
 namespace veltrad::platform {
@@ -30,7 +33,7 @@ struct MessageFormat {
 
 // Writes to the newest file "veltrad_SECONDS_messageLog.diag" in its directory and removes the others; a file
 // is used for at most a day. Keeps no state besides the directory. Lines are time-stamped and queued, and the
-// disk writer's thread writes them; lines that are not written are counted.
+// disk writer's thread writes all that wait at once; lines that are not written are counted.
 class MessageLog {
  public:
   // Limit for the lines that wait; a single one may be longer.
@@ -51,7 +54,11 @@ class MessageLog {
     std::optional<double> created;
   };
   void put(std::string_view format, std::initializer_list<std::string_view> values);
-  bool append(const std::string& line);
+  void writeWaiting();
+  // Their bytes count until end().
+  std::vector<std::string> takeWaiting();
+  void end(const std::vector<std::string>& lines);
+  bool append(std::span<const std::string> lines);
   std::optional<LogFile> newestSurvivor();
   std::optional<LogFile> createFile();
   void remove(const LogFile& file);
@@ -60,6 +67,12 @@ class MessageLog {
   const platform::Clock& _clock;
   const std::string _directory;
   platform::Counters& _counters;
+
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  // If there are any, a job that will take them is queued.
+  std::vector<std::string> _waiting GUARDED_BY(_mutex);
+  // Of these and of those that are being written.
+  std::size_t _bytes GUARDED_BY(_mutex) = 0;
 
   // Last, because its destructor ends the writer's use of the others.
   platform::DiskWriter::Queue _queue;

@@ -53,6 +53,8 @@ class ClientSessionInterface {
                                           std::uint16_t category, std::uint16_t type,
                                           OptionalDictionary payload, SentReply reply) = 0;
 
+  // Not a client's: called between two calls after somebody has nudged the connection.
+  virtual void takeNews() {}
   // The last call, made once, after the connection's invalidation handler has run.
   virtual void end() = 0;
   // For log lines; constant, and unique among live objects.

@@ -5,6 +5,7 @@
 #include <array>
 #include <bit>
 #include <cstdint>
+#include <optional>
 
 #include "wire/fates.h"
 
@@ -26,6 +27,10 @@ inline constexpr std::uint64_t kNoMessage = std::uint64_t{1} << 63;
 
 inline constexpr std::uint8_t kNoReason = 255;
 static_assert(kReasonCount < kNoReason);
+// Of an entry's `reason`.
+constexpr std::optional<Reason> reasonIn(std::uint8_t number) {
+  return number == kNoReason ? std::nullopt : std::optional(static_cast<Reason>(number));
+}
 
 // A text, and in the entries after it what of it did not fit.
 struct TextEntry {

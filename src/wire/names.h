@@ -24,6 +24,7 @@ inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:"
 // What those who look after the device ask on the control socket.
 namespace question {
 inline constexpr const char* kConfig = "config";
+inline constexpr const char* kContents = "contents";
 inline constexpr const char* kDoctor = "doctor";
 inline constexpr const char* kFates = "fates";
 inline constexpr const char* kHistory = "history";

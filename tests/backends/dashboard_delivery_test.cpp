@@ -15,20 +15,25 @@ namespace {
 using namespace std::chrono_literals;
 using Verdict = backends::DeliverySchedule::Verdict;
 
-// A network that takes datagrams on some ticks only; the first transmission is tick 0.
+// A network that takes datagrams on some ticks only; the first transmission is tick 0. On others they may not
+// leave.
 struct Network {
-  explicit Network(std::set<int> closedAt) : closed(std::move(closedAt)) {}
+  explicit Network(std::set<int> closedAt, std::set<int> forbiddenAt = {})
+      : closed(std::move(closedAt)), forbidden(std::move(forbiddenAt)) {}
   const std::set<int> closed;
+  const std::set<int> forbidden;
   int now = 0;
   std::vector<int> sentAt;
   std::vector<std::string> sent;
 
   backends::MessageQueue::Send send() {
-    return [this](std::string_view datagram) {
-      if (closed.contains(now)) return false;
+    return [this](std::string_view datagram, bool) {
+      using Sending = backends::MessageQueue::Sending;
+      if (forbidden.contains(now)) return Sending::forbidden;
+      if (closed.contains(now)) return Sending::notTaken;
       sentAt.push_back(now);
       sent.emplace_back(datagram);
-      return true;
+      return Sending::done;
     };
   }
 };
@@ -39,25 +44,32 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
     std::set<int> closed;
     std::vector<int> sentAt;
     int leavesAt;  // 0: never waited
+    std::set<int> forbidden = {};
   };
   for (const Case& c :
        std::vector<Case>{{true, {}, {0, 2, 5, 10, 19}, 20},
                          {true, {2, 3}, {0, 4, 7, 12, 21}, 22},     // a retransmission is tried again
                          {true, {0, 1, 2}, {3, 5, 8, 13, 22}, 23},  // counted from the first that went out
                          {false, {}, {0}, 0},                       // sent is done
-                         {false, {0, 1, 2}, {3}, 3}}) {
-    Network network(c.closed);
+                         {false, {0, 1, 2}, {3}, 3},
+                         {true, {}, {0, 2}, 5, {5}},
+                         {true, {0}, {}, 1, {1}},
+                         {false, {0, 1}, {}, 2, {2}}}) {
+    Network network(c.closed, c.forbidden);
     backends::MessageQueue queue(c.reliable, false, network.send());
     EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).fate,
               c.closed.contains(0) ? wire::Reason::datagram_held : wire::Reason::datagram_sent);
-    std::size_t givenUp = 0;
+    std::size_t givenUp = 0, forbidden = 0;
     while (!queue.empty() && network.now < 100) {
       ++network.now;
-      givenUp += queue.tick().givenUp;
+      const auto tick = queue.tick();
+      givenUp += tick.givenUp;
+      forbidden += tick.forbidden;
     }
     EXPECT_EQ(network.sentAt, c.sentAt);
     EXPECT_EQ(network.now, c.leavesAt);
-    EXPECT_EQ(givenUp, c.reliable ? 1u : 0u);
+    EXPECT_EQ(forbidden, c.forbidden.size());
+    EXPECT_EQ(givenUp, c.reliable && c.forbidden.empty() ? 1u : 0u);
   }
 }
 
@@ -90,9 +102,9 @@ TEST(DashboardDelivery, AnAcknowledgementRemovesTheOldestOfItsNumber) {
   }
   ++network.now;
   queue.tryToSendMsg("not sent yet", 9, platform::Charge());
-  EXPECT_FALSE(queue.acknowledge(6));
-  EXPECT_TRUE(queue.acknowledge(7));
-  EXPECT_TRUE(queue.acknowledge(9));
+  EXPECT_EQ(queue.acknowledge(6), std::nullopt);
+  EXPECT_EQ(queue.acknowledge(7), wire::Reason::datagram_acknowledged);
+  EXPECT_EQ(queue.acknowledge(9), wire::Reason::datagram_acknowledged);
   network.sent.clear();
   for (int i = 0; i < 2; ++i) ++network.now, queue.tick();
   EXPECT_EQ(network.sent, (std::vector<std::string>{"other", "newer"}));
@@ -104,29 +116,41 @@ TEST(DashboardDelivery, AnAcknowledgementOfASharedNumberAnswersOneCopy) {
   struct Case {
     std::string story;
     std::string waits;  // at its end
+    std::string told;   // whose acknowledgements were told of, "?" if it may be another's
+    bool idle;          // no answer can come that would be taken for that of the next one
   };
-  for (const Case& c : std::vector<Case>{
-           {"AB!", "B"},
-           {"AB!!", ""},
-           {"A..!B!", "B"},           // the second was A's retransmission's
-           {"A..!B!!", ""},           // and this is B's own
-           {"AB..!!!!C", "C"},        // two copies of each
-           {"AB..!!C!!", "C"},        // the same, C sent between
-           {"A..!B..!!", ""},         // A's first copy was lost: B is sent once more
-           {"A..!.........B!", "B"},  // the copy of the 2nd tick may still be answered on the 11th
-           {"A..!..........B!", ""},  // on the 12th no more
-           {"A!!B", "B"}}) {
+  for (const Case& c :
+       std::vector<Case>{{"AB!", "B", "A?", false},
+                         {"AB!!", "", "A?B", true},
+                         {"A..!B!", "B", "A", false},        // the second was A's retransmission's
+                         {"A..!B!!", "", "AB", true},        // and this is B's own
+                         {"AB..!!!!C", "C", "A?B?", false},  // two copies of each
+                         {"AB..!!C!!", "C", "A?B?", false},  // the same, C sent between
+                         {"A..!B..!!", "", "AB", false},     // A's first copy was lost: B is sent once more
+                         {"A..!.........B!", "B", "A",
+                          false},  // the copy of the 2nd tick may still be answered on the 11th
+                         {"A..!..........B!", "", "AB", true},  // on the 12th no more
+                         {"A..!", "", "A", false},
+                         {"A..!..........", "", "A", true},
+                         {"A!!B", "B", "A", false}}) {
     Network network({});
-    backends::MessageQueue queue(true, true, network.send());
+    std::string told;
+    backends::MessageQueue queue(true, true, network.send(), {},
+                                 [&](std::uint64_t message, wire::Step step, wire::Reason how) {
+                                   if (step == wire::Step::acknowledged) told += static_cast<char>(message);
+                                   if (how == wire::Reason::acknowledged_by_number) told += '?';
+                                 });
     for (const char step : c.story) {
       if (step == '.') {
         queue.tick();
       } else if (step == '!') {
         queue.acknowledge(1);
       } else {
-        queue.tryToSendMsg(std::string(1, step), 1, platform::Charge());
+        queue.tryToSendMsg(std::string(1, step), 1, platform::Charge(), {}, std::uint64_t(step));
       }
     }
+    EXPECT_EQ(told, c.told) << c.story;
+    EXPECT_EQ(queue.idle(), c.idle) << c.story;
     network.sent.clear();
     const std::size_t waiting = queue.size();
     while (!queue.empty()) queue.tick();

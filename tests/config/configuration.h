@@ -9,7 +9,9 @@
 #include "base/base64.h"
 #include "config/operator_settings.h"
 #include "config/process_settings.h"
+#include "config/seen_storebags_file.h"
 #include "config/storebag_store.h"
+#include "config/storebag_trust.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/machine.h"
@@ -59,6 +61,8 @@ struct Configuration {
   platform::Counters counters;
   config::OperatorSettings choices{files, root.settingsPath()};
   config::StorebagStore store{files, clock, root.storebagsDirectory()};
+  config::SeenStorebagsFile seen{files, root.seenStorebagsPath()};
+  config::StorebagTrust trust{veltra, files, seen, clock, counters, root.keysDirectory()};
   http::HTTPResult answer =
       Failure{http::HTTPError{http::HTTPError::Kind::transport, "Could not resolve host: bags.test"}};
   FakeHTTPClient client{[this](http::HTTPRequest) { return answer; }};

@@ -43,6 +43,7 @@ class RSAKey {
   std::string signBlock(std::string_view block) const {
     return privateOperation(block, RSA_NO_PADDING, nullptr);
   }
+  EVP_PKEY* get() const { return _key.get(); }
   std::size_t size() const { return static_cast<std::size_t>(EVP_PKEY_get_size(_key.get())); }
 
   std::string encoded(const char* structure = "SubjectPublicKeyInfo", int selection = EVP_PKEY_PUBLIC_KEY,

@@ -30,8 +30,9 @@ using Cause = config::StorebagCause;
 struct Fetch : config::WholeStorebagAnswer {
   Fetch(Configuration& configuration, const Lines& lines) {
     const ExpectedLog log(lines);
-    config::StorebagDownload download(configuration.client, configuration.settings, configuration.veltra);
-    WholeStorebagAnswer::operator=(download.fetchStorebagWithName("ostvane", std::nullopt));
+    config::StorebagDownload download(configuration.client, configuration.settings, configuration.veltra,
+                                      configuration.trust);
+    WholeStorebagAnswer::operator=(download.fetchStorebagWithName("ostvane", std::nullopt, {}));
   }
 };
 
@@ -132,7 +133,8 @@ struct Choice : config::StorebagSectionAnswer {
     configuration.answers(container(formats::writeXMLPropertyList(storebag)),
                           {{"Cache-Control", cacheControl}});
     config::StorebagSections sections(configuration.client, configuration.settings, configuration.veltra,
-                                      configuration.choices, configuration.store, configuration.counters);
+                                      configuration.trust, configuration.choices, configuration.store,
+                                      configuration.counters);
     StorebagSectionAnswer::operator=(sections.fetchStorebagForEnvironmentAndClientType(5, std::nullopt));
   }
 };

@@ -121,5 +121,48 @@ TEST(StorebagKey, TakesPublicKeysInBoundsAlone) {
   }
 }
 
+TEST(StorebagKey, OfAFileIsRSAOrEd25519InEitherForm) {
+  const RSAKey signer(EVP_PKEY_Q_keygen(nullptr, nullptr, "ED25519"));
+  const std::string der = signer.encoded();
+  EXPECT_FALSE(config::StorebagKey::fromDER(der));  // publicKey.der is RSA's
+  std::string signature(64, '\0');
+  std::size_t length = signature.size();
+  const std::shared_ptr<EVP_MD_CTX> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
+  ASSERT_TRUE(EVP_DigestSignInit(context.get(), nullptr, nullptr, nullptr, signer.get()) == 1 &&
+              EVP_DigestSign(context.get(), out(signature), &length, in(kBag), kBag.size()) == 1);
+  for (const std::string& form :
+       {der, signer.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM"),
+        "# ours\n" + signer.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM")}) {
+    const auto key = config::StorebagKey::fromFile(form);
+    ASSERT_TRUE(key);
+    EXPECT_EQ(key->kind(), config::StorebagKey::Kind::ed25519);
+    EXPECT_TRUE(key->verifies(kBag, signature));
+    EXPECT_FALSE(key->verifies(kBag + " ", signature));
+    for (std::size_t bit = 0; bit < signature.size() * 8; ++bit) {
+      std::string bad = signature;
+      bad[bit / 8] ^= static_cast<char>(1 << bit % 8);
+      EXPECT_FALSE(key->verifies(kBag, bad)) << bit;
+    }
+    for (const std::string& bad : {signature.substr(1), signature + "\0"s, ""s, RSAKey::shared().sign(kBag)})
+      EXPECT_FALSE(key->verifies(kBag, bad)) << bad.size();
+  }
+  const RSAKey& rsa = RSAKey::shared();
+  for (const std::string& form : {rsa.encoded(), rsa.encoded("type-specific"),
+                                  rsa.encoded("SubjectPublicKeyInfo", EVP_PKEY_PUBLIC_KEY, "PEM"),
+                                  rsa.encoded("type-specific", EVP_PKEY_PUBLIC_KEY, "PEM")}) {
+    const auto key = config::StorebagKey::fromFile(form);
+    ASSERT_TRUE(key);
+    EXPECT_EQ(key->kind(), config::StorebagKey::Kind::rsa);
+    EXPECT_TRUE(key->verifies(kBag, rsa.sign(kBag)));
+  }
+  for (const std::string& bytes :
+       {""s, "-----BEGIN PUBLIC KEY-----"s, der + "\0"s, der.substr(1),
+        signer.encoded("PrivateKeyInfo", EVP_PKEY_KEYPAIR, "PEM"),
+        RSAKey(EVP_PKEY_Q_keygen(nullptr, nullptr, "X25519")).encoded(),
+        RSAKey(EVP_PKEY_Q_keygen(nullptr, nullptr, "ED448")).encoded(), std::string(1u << 17, 'A')}) {
+    EXPECT_FALSE(config::StorebagKey::fromFile(bytes)) << bytes.size();
+  }
+}
+
 }  // namespace
 }  // namespace veltrad

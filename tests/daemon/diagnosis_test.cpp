@@ -41,6 +41,7 @@ Facts sound() {
                               finding("quindle", StorebagCause::none)};
   facts.storebags.needed = true;
   facts.storebags.section = "release";
+  facts.storebags.places = {"/keys", "/settings", "/seen"};
   facts.machine = {daemon::Consent::given, "/log", "", true, "in force", 20'000, 9'000, 1'800'000'000};
   return facts;
 }
@@ -48,6 +49,12 @@ Facts sound() {
 TEST(Diagnosis, NamesWhatIsWrongAndNothingElse) {
   const auto replaceLast = [](StorebagCause cause, int status) {
     return [=](Facts& facts) { facts.storebags.findings.back() = finding("quindle", cause, status); };
+  };
+  const auto replaceRefused = [=](wire::Reason reason) {
+    return [=](Facts& facts) {
+      replaceLast(StorebagCause::refused, 200)(facts);
+      facts.storebags.findings.back().answer.refusal = reason;
+    };
   };
   const auto spare = [=](int status) {
     return [=](Facts& facts) {
@@ -63,6 +70,9 @@ TEST(Diagnosis, NamesWhatIsWrongAndNothingElse) {
       {replaceLast(StorebagCause::content, 200), "storebag", "failure", "publish"},
       {replaceLast(StorebagCause::noAttempt, 0), "storebag", "failure", "again"},
       {replaceLast(StorebagCause::noAnswer, 0), "storebag", "failure", "https://bags.test/x"},
+      {replaceRefused(wire::Reason::storebag_rolled_back), "storebag", "failure", "--serial"},
+      {replaceRefused(wire::Reason::storebag_seen_unreadable), "storebag", "failure", "remove /seen"},
+      {replaceRefused(wire::Reason::storebag_key_revoked), "signature", "failure", "\"keys\" of /settings"},
       {spare(404), "storebag", "warning", "publish"},
       {spare(500), "storebag", "failure", "publish"},
       {[](Facts& facts) { facts.storebags.findings[1].emptyRecord = true; }, "environment", "failure",

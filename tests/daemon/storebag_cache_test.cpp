@@ -41,6 +41,9 @@ struct Source final : config::StorebagSource {
     answer.version = "v" + std::to_string(fetches);
     return answer;
   }
+  std::optional<std::string> whyNotUsed(const config::StorebagSection&) override {
+    return expired ? std::optional<std::string>("expired on Monday") : std::nullopt;
+  }
   void waitForFetches(int count) {
     std::unique_lock held(mutex);
     ASSERT_TRUE(changed.wait_for(held, std::chrono::seconds(10), [&] { return fetches >= count; }));
@@ -61,6 +64,7 @@ struct Source final : config::StorebagSource {
   bool attempts = true;
   bool hold = false;
   bool lacksMemory = false;
+  bool expired = false;
   int fetches = 0;
 };
 
@@ -148,6 +152,28 @@ TEST_F(Cache, AFailureIsRetriedAfter900SecondsAndKeepsWhatWasThere) {
   clock.advance(59);
   EXPECT_EQ(ask(7), section);
   EXPECT_EQ(source.fetches, 3);
+}
+
+TEST_F(Cache, WhatHasExpiredIsNotServedAndMustComeWhole) {
+  source.newLastModified = "Monday";
+  const auto section = ask(7);
+  EXPECT_EQ(cache.standingForClientType(7).section, section);
+  EXPECT_FALSE(cache.standingForClientType(7).due);
+  source.expired = true;
+  log.expectLine(RecordedLog::Level::error, "Storebag '' refused: expired on Monday");
+  EXPECT_EQ(cache.standingForClientType(13).section, nullptr);
+  EXPECT_TRUE(cache.standingForClientType(7).due);
+  log.expectLine(RecordedLog::Level::error,
+                 "fetchAndCacheStorebag: Unable to fetch storebag for client type 7");
+  source.section.reset();
+  EXPECT_EQ(ask(7), nullptr);
+  EXPECT_EQ(source.conditional, std::nullopt);
+  clock.advance(899);
+  EXPECT_EQ(ask(7), nullptr);
+  EXPECT_EQ(source.fetches, 2);
+  EXPECT_FALSE(cache.standingForClientType(7).due);
+  source.expired = false;  // the clock was wrong
+  EXPECT_EQ(ask(7), section);
 }
 
 TEST_F(Cache, ATypeWithoutAStorebagLeavesNoRecord) {

@@ -2,8 +2,8 @@
 # SPDX-License-Identifier: Apache-2.0
 """Runs the tests with real processes: all of them, or those given as arguments (road, test_road.Road.test_examples).
 
-VELTRA_BUILD is the build directory, by default build/dev. Each class runs in its own process, two at a time. The last line
-is "N passed, N failed"; the exit status is 1 if any test failed."""
+VELTRA_BUILD is the build directory, by default build/dev. Each class runs in its own process; four run at a time on two cores,
+because they mostly wait. The last line is "N passed, N failed"; the exit status is 1 if any test failed."""
 import concurrent.futures
 import os
 import pathlib
@@ -48,7 +48,7 @@ def main(names):
     for test in leaves(unittest.defaultTestLoader.loadTestsFromNames(names)):
         classes.setdefault(type(test), []).append(test.id())
     total_passed = total_failed = 0
-    with concurrent.futures.ThreadPoolExecutor(min(2, os.cpu_count() or 1)) as pool:
+    with concurrent.futures.ThreadPoolExecutor(2 * min(2, os.cpu_count() or 1)) as pool:
         for done in concurrent.futures.as_completed([pool.submit(run_apart, ids) for ids in classes.values()]):
             name, passed, failed, seconds, output = done.result()
             total_passed, total_failed = total_passed + passed, total_failed + failed

@@ -110,6 +110,10 @@ class Control(SystemTest):
                     self.assertEqual(done.returncode, 0 if answered else 1, done.stderr)
                     if not answered:
                         self.assertIn(OBSERVE, done.stderr)
+            self.root.grant([{"uid": NOBODY, "entitlements": {OBSERVE: True}}])
+            done = subprocess.run([program("veltractl"), "watch", "--contents"], capture_output=True, text=True,
+                                  env=self.root.environment(), user=NOBODY, timeout=DEADLINE)
+            self.assertEqual((done.returncode, CONTROL in done.stderr), (1, True), done.stderr)
 
     @unittest.skipIf(os.getuid() != 0, "only root can be another user")
     def test_places_are_kept_for_root(self):

@@ -4,6 +4,7 @@ import base64
 import gzip
 import hashlib
 import json
+import plistlib
 import socket
 import struct
 import unittest
@@ -31,10 +32,27 @@ class LabAlone(unittest.TestCase):
         response, body = self.get("signed")
         self.assertEqual((response.status, b"signed already" in body), (500, True))
         self.assertEqual([a["outcome"] for a in self.lab.received("storebags")], ["200", "404", "404", "404", "500", "500"])
-        for rule, word in (({"stats": 1}, "stats"), ({"status": "503"}, "status"), ({"times": 0}, "times")):
+        for rule, word in (({"stats": 1}, "stats"), ({"status": "503"}, "status"), ({"times": 0}, "times"),
+                           ({"bag": {"speed": 1}}, "bag"), ({"bag": {"clock": "noon"}}, "bag")):
             response, body = self.lab.request("POST", "/control", json.dumps(rule))
             self.assertEqual(response.status, 400)
             self.assertIn(f'"{word}": expected', body.decode())
+
+    def test_stamps(self):
+        bag = lambda: plistlib.loads(base64.b64decode(plistlib.loads(self.get()[1])["bag"]))
+        self.lab.control(path="/", bag={"serial": 3, "name": "n", "clock": "2026-01-01T00:00:00Z", "validFor": 61})
+        self.assertEqual([bag()[key] for key in ("serial", "name", "expires")], [3, "n", "2026-01-01T00:01:01Z"])
+        keys = [hashlib.sha256((self.lab.path / "signing" / name).read_bytes()).hexdigest()
+                for name in ("publicKey.der", "ed25519.der")]
+        self.assertEqual([one["key"] for one in plistlib.loads(self.get()[1])["signatures"]], [keys[1][:16]])
+        self.lab.control(path="/", bag={"revoked": ["signing", "a" * 64], "ed25519": []})
+        self.assertEqual(bag()["revoked"], [*keys, "a" * 64])
+        self.assertNotIn("signatures", plistlib.loads(self.get()[1]))
+        self.lab.control(path="/", bag={"key": "nobody"})
+        response, body = self.get()
+        self.assertEqual((response.status, b"signing/nobody/private.pem" in body), (500, True))
+        (self.lab.path / "storebags/quindle").write_bytes(b"as it is")
+        self.assertEqual(self.get()[1], b"as it is")
 
     def test_collector(self):
         packed = gzip.compress(b'{"a":\n"x"}')

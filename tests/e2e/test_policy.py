@@ -2,18 +2,42 @@
 """What the owner of the device says in policy.json, on open sessions and before anything leaves."""
 import hmac
 import json
+import os
+import shutil
 import socket
+import subprocess
 import threading
 import time
 
-from harness import wait_until
-from test_https import HTTPSTest, entry
+from harness import program, wait_until
+from test_adaptor import BUNDLE, GOOD
+from test_https import Client, HTTPSTest, entry
 
 POLICY = "etc/veltrad/policy.json"
 DAEMON_LINE = "hearOwner: The owner's word has changed: "
 UPLOAD_LOG = "uploadLogData:completionHandler:"
 BACKENDS = ["ampery", "dashboard", "httppost", "uploadserver"]
 WHO = {"clientName": "phone", "serviceName": "phone"}
+
+
+def peers(daemon):
+    """The ports of the servers that the daemon has connections to."""
+    sockets = {name[len("socket:["):-1] for name in daemon.descriptors() if name.startswith("socket:[")}
+    rows = [line.split() for kind in ("tcp", "tcp6") for line in open(f"/proc/{daemon.popen.pid}/net/{kind}").readlines()[1:]]
+    return {int(row[2].rsplit(":", 1)[1], 16) for row in rows if row[9] in sockets}
+
+
+class Aggregator(Client):
+    """Collects the copies that it gets."""
+
+    def __init__(self, *arguments, **options):
+        self.copies = []
+        super().__init__(*arguments, **options)
+
+    def frame(self):
+        while (frame := super().frame()) and frame[0] == self.EVENT:
+            self.copies.append(frame[2])
+        return frame
 
 
 class PolicyTest(HTTPSTest):
@@ -28,6 +52,12 @@ class PolicyTest(HTTPSTest):
             "httppost": {"clients": list(entries) or [entry(client=None, override_dnu=1)]},
             "dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}", "post_url": "${url}/logdata", "reliable": reliable},
             "uploadserver": {"post_url": "${url}/upload"}, "ampery": {}}})
+
+    def adaptor(self):
+        self.addCleanup(os.umask, os.umask(0o022))
+        bundle = self.root.path / BUNDLE
+        bundle.parent.mkdir(parents=True)
+        shutil.copy(GOOD, bundle)
 
     def say(self, **rules):
         self.root.write(POLICY, b"// as the owner writes it\n" + json.dumps(rules).encode())
@@ -86,6 +116,34 @@ class Policy(PolicyTest):
             session.message(number=2)
             self.lab.wait_for_events(1, number=2)
 
+    def test_consent_that_comes_and_goes_reaches_open_sessions(self):
+        self.everything("quindle", entry("phone"), entry("free", override_dnu=1))
+        self.lab.control(path="/dashboard", ack="drop")
+        self.say(consent="always")
+        with self.serving() as daemon:
+            sessions = [self.client("phone", requireUserInfo=True, batchEvent=True), self.client("free", batchEvent=True)]
+            for turn in range(1, 3):
+                for session in sessions:
+                    session.message(number=-turn)
+                self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+                daemon.wait_for_line(DAEMON_LINE + "policy_consent", turn)
+                before = self.arrived()
+                for session, name in zip(sessions, ("phone", "free")):
+                    self.assertEqual(session.states(clientName=name, serviceName=name), [])
+                    session.message(number=-turn)
+                    session.flush()
+                self.assertEqual(self.arrived(), before)
+                self.root.prefer(DiagnosticLogSubmissionEnabled=True)
+                daemon.wait_for_line(DAEMON_LINE + "back ends may report", turn)
+                for session, name in zip(sessions, ("phone", "free")):
+                    wait_until(lambda: session.states(clientName=name, serviceName=name) == BACKENDS, "the back ends again")
+                    session.message(number=turn)
+                    session.flush()
+                self.lab.wait_for_events(2, number=turn)
+            # What waited when the consent went is gone: batched events, and datagrams that nobody acknowledged.
+            self.assertFalse([event for event in self.lab.events() if event.get("number", 0) < 0])
+            wait_until(lambda: self.stats().get("datagram dropped: the owner of the device does not let it leave", 0) >= 4, "dropped datagrams")
+
     def test_back_ends_and_hosts_that_are_not_listed_are_not_made_or_reached(self):
         with self.serving("Unable to fetch storebag", "No storebag", "Could not fetch") as daemon:
             self.say(backends=["httppost", "later"])
@@ -105,13 +163,15 @@ class Policy(PolicyTest):
 
     def test_fields_are_taken_out_of_everything_and_hashed_everywhere(self):
         self.root.prefer(forceEventLogging=True, environmentType=1)
+        self.adaptor()
         self.lab.put("quindle", {"version": "v", "development": {
-            "httppost": {"clients": [entry()]}, "ampery": {},
+            "httppost": {"clients": [entry()]}, "ampery": {}, "mivo": {},
             "dashboard": {"ip": "127.0.0.1", "port": "${dashboardPort}", "post_url": "${url}/logdata"}}})
         self.say(remove=["SECRET", "serviceName"], hash=["number"], history={})
         with self.serving("unable to handle key: deep") as daemon:
-            session = self.client("phone", user_info={"serviceName": "hidden-service", "number": "hidden-info"})
-            session.message(secret="hidden-text", number="hidden-number", deep={"list": [{"Secret": "hidden-deep"}]}, kept=1)
+            session = Aggregator(self.root, "phone", aggregates=True, user_info={"serviceName": "hidden-service", "number": "hidden-info"})
+            self.addCleanup(session.close)
+            reply = session.message(secret="hidden-text", number="hidden-number", deep={"list": [{"Secret": "hidden-deep"}]}, kept=1)
             session.ask(UPLOAD_LOG, data=[{"secret": "hidden-log", "kept": 2}])
             event = self.lab.wait_for_events(1, kept=1)[0]
             self.lab.received("dashboard", 2)
@@ -125,13 +185,18 @@ class Policy(PolicyTest):
         self.assertEqual(event["number"], digest["hidden-info"])
         self.assertNotIn("secret", event)
         seen = json.dumps([self.lab.received(kind) for kind in ("events", "dashboard", "logdata")]) + "\n".join(daemon.text) + shown
-        logs = [path for path in self.root.path.rglob("*") if path.is_file() and "etc" not in path.parts]
-        for text in [seen, *(path.read_bytes().decode("latin-1") for path in logs)]:
+        logs = {path.name: path.read_bytes().decode("latin-1") for path in self.root.path.rglob("*")
+                if path.is_file() and "etc" not in path.parts and path.suffix != ".so"}
+        for text in [seen, str(reply), str(session.copies), *logs.values()]:
             self.assertNotIn("hidden", text)
-        self.assertIn(digest["hidden-number"], shown)
-        self.assertIn(digest["hidden-number"], (self.root.path / "var/log/veltrad/energy.jsonl").read_text())
+        message_log = next(name for name in logs if name.endswith(".diag"))
+        for text in (shown, logs["energy.jsonl"], logs["example-adaptor.jsonl"], logs[message_log]):
+            self.assertIn(digest["hidden-number"], text)
+        self.assertIn(digest["hidden-info"], str(session.copies))
 
     def test_closed_gates_bring_not_one_packet_to_any_server_but_the_storebags(self):
+        self.adaptor()
+        local = [self.root.path / "var/log/veltrad" / name for name in ("energy.jsonl", "example-adaptor.jsonl")]
         gates = (({"consent": "always"}, False), ({"reporting": "off"}, True), ({"hosts": ["localhost"]}, True))
         for rules, consent in gates:
             with socket.create_server(("127.0.0.1", 0)) as server, socket.socket(socket.AF_INET, socket.SOCK_DGRAM) as dashboard:
@@ -140,10 +205,10 @@ class Policy(PolicyTest):
                 self.lab.put("quindle", {"version": "v", "release": {
                     "httppost": {"clients": [entry(client=None, override_dnu=1, post_url=url, realtime_post_url=url)]},
                     "dashboard": {"ip": "127.0.0.1", "port": dashboard.getsockname()[1], "post_url": url, "reliable": 50},
-                    "uploadserver": {"post_url": url}, "ampery": {}}})
+                    "uploadserver": {"post_url": url}, "ampery": {}, "mivo": {}}})
                 self.say(**rules)
                 self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
-                with self.serving("without requiring it", "user info provided", "stays: the owner", "upload failed", "Only upload"):
+                with self.serving("without requiring it", "user info provided", "stays: the owner", "upload failed", "Only upload") as daemon:
                     for required in (False, True):
                         session = self.client(requireUserInfo=required, batchEvent=required)
                         for flag in range(4):
@@ -155,6 +220,9 @@ class Policy(PolicyTest):
                     log = self.root.path / "some.log"
                     log.write_text("x")
                     self.ctl("upload", "--client-type", "7", "--session-id", "9", str(log), status=1)
+                    self.assertLessEqual(peers(daemon), {self.lab.port})
+                # What stays on the device has no host.
+                self.assertEqual([path.exists() for path in local], ["hosts" in rules] * 2, rules)
                 for watched in (server, dashboard):
                     watched.setblocking(False)
                 with self.assertRaises(BlockingIOError, msg=rules):
@@ -165,8 +233,10 @@ class Policy(PolicyTest):
 
     def test_a_withdrawal_under_load_stops_the_last_packet_within_a_second(self):
         self.say(consent="always")
+        log = self.root.path / "some.log"
         # A post that had not begun when the consent was withdrawn.
-        with self.serving("The owner of the device does not let it leave (policy_consent)"):
+        with self.serving("The owner of the device does not let it leave (policy_consent)", "upload failed", "stays: the owner",
+                          "Error uploading log data array"):
             clients = [self.client(batchEvent=batched) for batched in (False, False, True)]
             stop = threading.Event()
 
@@ -174,17 +244,29 @@ class Policy(PolicyTest):
                 while not stop.is_set():
                     client.message(text="x" * 200)
                     client.flush()
+
+            def log_data(client):
+                while not stop.is_set():
+                    client.ask(UPLOAD_LOG, data=["x" * 1000])
+
+            def files():
+                while not stop.is_set():
+                    log.write_text("x" * 1000)
+                    subprocess.run([program("veltractl"), "upload", "--client-type", "7", "--session-id", "9", str(log)],
+                                   env=self.root.environment(), capture_output=True)
             threads = [threading.Thread(target=load, args=(client,)) for client in clients]
+            threads += [threading.Thread(target=log_data, args=(self.client(),)), threading.Thread(target=files)]
             for thread in threads:
                 thread.start()
-            self.lab.received("events", 100)
+            for kind, count in (("events", 100), ("logdata", 10), ("uploads", 3)):
+                self.lab.received(kind, count)
             withdrawn = time.time()
             self.root.prefer(DiagnosticLogSubmissionEnabled=False)
             wait_until(lambda: time.time() > withdrawn + 1.5, "what may still come")
             stop.set()
             for thread in threads:
                 thread.join()
-        for kind in ("events", "dashboard"):
+        for kind in ("events", "dashboard", "logdata", "uploads"):
             last = max(line["time"] for line in self.lab.received(kind))
             self.assertLess(last, withdrawn + 1, kind)
 

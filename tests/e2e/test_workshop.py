@@ -1,20 +1,26 @@
 # SPDX-License-Identifier: Apache-2.0
 """veltra-storebag as whoever writes a storebag uses it: files, standard input, exit statuses, an editor's schema."""
+import functools
 import json
 import os
 import pathlib
-import random
+import re
+import shutil
 import subprocess
 import tempfile
 import unittest
 import xml.etree.ElementTree
 
-from harness import DEVICE, SOURCE, START, SystemTest, Wire, program
+from harness import SOURCE, program
 
-try:
-    import jsonschema
-except ImportError:
-    jsonschema = None
+# An existing validator of JSON Schema. Prints the errors of each storebag.
+VALIDATOR = """const {schema, bags} = JSON.parse(require('fs').readFileSync(0)), Ajv = require('ajv');
+const ajv = new Ajv({allErrors: true, schemaId: '$id'});
+if (!ajv.validateSchema(schema)) throw new Error(ajv.errorsText());
+const check = ajv.compile(schema);
+console.log(JSON.stringify(bags.map(bag => check(bag) ? [] : check.errors)));"""
+NODE = {**os.environ, "NODE_PATH": "/usr/share/nodejs"}
+HAS_VALIDATOR = shutil.which("node") and subprocess.run(["node", "-e", "require('ajv')"], env=NODE, capture_output=True).returncode == 0
 
 ENTRY = {"locale_whitelist": ["US"], "filters": [{"key": "peer", "action": "remove"}], "sampling_threshold": 0.5,
          "post_url": "https://c.example/e"}
@@ -105,17 +111,18 @@ class Workshop(unittest.TestCase):
         self.assertEqual(run("fmt", "--check", SOURCE / "examples/storebag.json")[0], 0)
         self.assertEqual(run("fmt", self.file("list", "<plist><dict/></plist>"))[0], 1)
 
-    @unittest.skipUnless(jsonschema, "python3-jsonschema is not installed")
+    @unittest.skipUnless(HAS_VALIDATOR, "there is no node-ajv")
     def test_schema(self):
         schema = json.loads(run("schema")[1])
-        jsonschema.Draft7Validator.check_schema(schema)
-        validator = jsonschema.Draft7Validator(schema)
         good = (bag(), bag(client="a,b c", override_dnu=True, per_country_sampling_thresholds=[{"country": ["US"], "threshold": 1}]),
                 {"version": "1", "release": {"dashboard": {"ip": "10.0.0.1", "port": 1, "reliable": 50}, "ampery": {}}})
         bad = (bag(sampling_threshold=2), bag(client="a, b"), bag(filters=[{"key": "a"}]), bag(post_url="http://a"), bag(surprise=1),
-               bag(locale_whitelist=[]), {"release": {}}, {"version": "1", "release": {"dashboard": {"ip": "name", "port": 1}}})
-        for content in good + bad:  # the schema says what lint says
-            errors = [e.message for e in validator.iter_errors(content)]
+               bag(locale_whitelist=[]), {"release": {}}, {"version": "1", "release": {"dashboard": {"ip": "name", "port": 1}}},
+               bag(filters=[{"key": "a ", "action": "remove"}]))
+        done = subprocess.run(["node", "-e", VALIDATOR], env=NODE, input=json.dumps({"schema": schema, "bags": good + bad}),
+                              capture_output=True, text=True)
+        self.assertEqual((done.returncode, done.stderr), (0, ""))
+        for content, errors in zip(good + bad, json.loads(done.stdout)):  # the schema says what lint says
             findings = json.loads(run("lint", "--json", "-", given=json.dumps(content))[1])
             self.assertEqual(not errors, content in good, (content, errors))
             self.assertEqual(any(f["severity"] == "error" for f in findings), content in bad, (content, findings))
@@ -144,98 +151,76 @@ class Workshop(unittest.TestCase):
         self.assertRegex(error, r'suite:1:\d+: unknown key "clientTyp" in "given": did you mean "clientType"')
 
 
-def draws():
-    """The daemon's sampling factors after a start: drand48 without a seed."""
-    state = 0
-    while True:
-        state = (0x5DEECE66D * state + 0xB) % 2**48
-        yield state / 2**48
+    def test_what_is_played_is_checked(self):
+        bare, files = self.file("bag", bag()), {
+            "device": '{"DeviceNam": "Elm"}', "policy.json": '{\n  "hosts": "a.example"}', "messages": '\n{"op": "send", "category": 7}\n'}
+        files = {name: self.file(name, content) for name, content in files.items()}
+        for options, status, said in (
+                (("--draw", "httppst=0.5"), 2, 'unknown back end "httppst": did you mean "httppost"?'),
+                (("--draw", "1.5"), 2, "1.5 is no sampling factor: expected a number from 0 to 1"),
+                (("--country", "USA"), 2, '"USA" is no country: expected two letters like US'),
+                (("--environment", "relase"), 2, 'did you mean "release"?'), (("--user-info", "room"), 2, "expected KEY=VALUE"),
+                (("--category", "5"), 1, "a message needs --category and --type"),
+                (("--device", files["device"]), 1, f'{files["device"]}: unknown key "DeviceNam": did you mean "DeviceName"?'),
+                (("--policy", files["policy.json"]), 1, f'{files["policy.json"]}:2:3: "hosts" is "a.example": expected an array of texts'),
+                (("--messages", files["messages"]), 1, f'{files["messages"]}:2:1: "type" is missing: expected an integer')):
+            told = run("explain", bare, *options)
+            self.assertEqual((told[0], told[1]), (status, ""), options)
+            self.assertIn(said, told[2])
+        told = json.loads(run("explain", "--json", bare, "--country", "us", "--require-user-info", "--client", "x")[1])
+        self.assertEqual(told["backends"]["httppost"]["reason"], "reports")
 
+    def edited(self, storebag, edits):
+        """The storebag with other values; numbers among "clients" stand for its entries."""
+        entries = storebag["release"]["httppost"]["clients"]
 
-RUN = {"_startTS", "_clientTS", "eventTime", "_sessionID", "_timezoneOffset", "_reportVers"}
+        def resolved(value):
+            if isinstance(value, dict):
+                return {key: [entries[one] if isinstance(one, int) else one for one in item] if key == "clients" else resolved(item)
+                        for key, item in value.items()}
+            return value
+        made = json.loads(json.dumps(storebag))
+        for path, value in edits.items():
+            *way, last = [int(step) if step.isdigit() else step for step in path.split("/")]
+            place = functools.reduce(lambda at, step: at[step], way, made)
+            place[last] = resolved({last: value})[last]
+            if value is None:
+                del place[last]
+        return made
 
+    def test_differences(self):
+        text = (SOURCE / "tests/tools/storebag/diffs.json").read_text()
+        prepared = json.loads(re.sub("^//.*", "", text, flags=re.MULTILINE))
+        old = self.file("old", prepared["storebag"])
+        for pair in prepared["pairs"]:
+            with self.subTest(edit=pair["edit"]):
+                new = self.file("new", self.edited(prepared["storebag"], pair["edit"]))
+                status, text, error = run("diff", "--json", old, new)
+                told = [[change[key] for key in ("effect", "kind", "section", "backend", "client", "key", "text")]
+                        for change in json.loads(text)["changes"]]
+                self.assertEqual((told, error), (pair["expect"], ""))
+                self.assertEqual(status, int(any(row[0] == "more" for row in pair["expect"])))
+                text = run("diff", old, new)[1]
+                self.assertEqual([row[6] for row in pair["expect"] if row[6] not in text], [])
 
-class DaemonAndExplain(SystemTest):
-    """What explain says equals what the daemon does, for random storebags, sessions and messages."""
-
-    def entry(self, chance, name, i):
-        pick = chance.choice
-        entry = {"client": pick(["phone", "lamp", "phone,lamp", "Clock"]), "locale_whitelist": pick([["US"], ["US", "DE"], ["FR"]]),
-                 "filters": [{"key": key, "action": pick(["remove", "sha256", "keep"]), **pick([{}, {}, {"method": 5}, {"status": 2}])}
-                             for key in chance.sample(["a", "B", "c", "list", "room", "clientName"], chance.randrange(5))],
-                 "sampling_threshold": pick([1, 0.6, 0.3, 0]), "override_sampling": pick([1, 0.5, 0]),
-                 "event_threshold": pick([0, 1, 49]), "post_url": f"{self.lab.url}/events/{name}/{i}"}
-        more = {"service": "ring", "expedite": pick([0, 1]), "override_dnu": pick([0, 1]), "device_blacklist": [pick(["Elm", "Oak"])],
-                "realtime_post_url": f"{self.lab.url}/events/{name}/fast", "custom_clientId": 1, "hierarchy": 0,
-                "per_country_sampling_thresholds": [{"country": ["US"], "threshold": pick([0.2, 1])}]}
-        return {**entry, **{key: more[key] for key in more if chance.random() < 0.25}}
-
-    def session(self, chance, number):
-        names = {"clientName": chance.choice(["phone", "LAMP", "clock", "door"]), "serviceName": chance.choice(["ringer", "x"])}
-        info = chance.choice([names, {**names, "room": "r", "a": "u"}, None])
-        messages = [{"category": chance.choice([5, 6]), "type": chance.choice([2, 3]), "flag": chance.choice([0, 0, 0, 1, 2, 3]),
-                     "payload": {key: chance.choice(["text", 7, 0.5, True, [1], {"b": 1}])
-                                 for key in chance.sample(["a", "b", "c", "list", "d"], chance.randrange(5))}}
-                    for _ in range(chance.randrange(4))]
-        return {"number": number, "info": info, "messages": messages, "required": chance.random() < 0.8, "batch": chance.random() < 0.5}
-
-    def explained(self, bag, session, factors, consent):
-        lines = self.root.path / "messages.jsonl"
-        lines.write_text("".join(json.dumps({"op": "send", **message}) + "\n" for message in session["messages"]))
-        options = [x for k, v in (session["info"] or {}).items() for x in ("--user-info", f"{k}={v}")]
-        options += ["--require-user-info"] * session["required"] + ["--batch-events"] * session["batch"]
-        options += [x for k, v in factors.items() for x in ("--draw", f"{k}={v!r}")]
-        status, text, error = run("explain", bag, "--client-type", 7, "--client-version", session["number"], "--country", "US",
-                                  "--consent", "yes" if consent else "no", "--device", self.root.path / "device.json",
-                                  "--messages", lines, "--json", *options)
-        self.assertEqual(status, 0, error)
-        return json.loads(text)["backends"]
-
-    def play(self, session):
-        wire = Wire(self.root)
-        wire.call("setSessionInfo:userInfo:frameworksToCheck:hasAggregationBlock:", hasAggregationBlock=False, frameworksToCheck=[],
-                  sessionInfo={"clientType": 7, "sessionID": 1, "clientVersion": session["number"],
-                               "requireUserInfo": session["required"], "batchEvent": session["batch"]},
-                  **({"userInfo": session["info"]} if session["info"] else {}))
-        backends = wire.call(START)["results"].get("backends")
-        for message in session["messages"]:
-            wire.call("sendMessageWithDictionary:reply:", message=message)
-        wire.call("flushMessagesWithCompletion:")
-        wire.close()
-        return backends
-
-    def test_random_storebags(self):
-        seed = int(os.environ.get("VELTRA_SEED", "18"))
-        bags, sessions = (int(os.environ.get(f"VELTRA_{what}", count)) for what, count in (("BAGS", "4"), ("SESSIONS", "12")))
-        (self.root.path / "device.json").write_text(json.dumps(DEVICE))
-        events = 0
-        for i in range(bags):
-            chance, factors, explained, consent = random.Random(seed + i), draws(), {}, i % 4 != 3
-            content = {"version": f"v{i}", "release": {
-                name: {"clients": [self.entry(chance, name, k) for k in range(chance.randrange(1, 5))]} for name in ("httppost", "httppost2")}}
-            self.lab.put("quindle", content)
-            (self.root.path / "bag.json").write_text(json.dumps(content))
-            self.root.prefer(DiagnosticLogSubmissionEnabled=consent)
-            seen = len(self.lab.received("events"))
-            with self.serving("Quillfen", "user info provided without requiring it", "filters"):
-                for number in range(sessions):
-                    session = self.session(chance, number)
-                    told = self.explained(self.root.path / "bag.json", session, {n: next(factors) for n in ("httppost", "httppost2")}, consent)
-                    reporting = self.play(session)
-                    self.assertEqual(reporting, [n for n in told if told[n]["state"] in (2, 3)], (seed, i, session, told))
-                    for name, backend in told.items():
-                        explained[name, str(number)] = (backend["events"], session)
-            left = {}
-            for post in self.lab.received("events")[seen:]:
-                key = post["path"].split("/")[2], post["headers"]["X-VLT-Client-Version"]
-                left.setdefault(key, []).extend(e for e in post["body"]["events"] if (e["_method"], e["_status"]) != (0, 1))
-            for key, (expected, session) in explained.items():
-                got = sorted(left.get(key, []), key=lambda e: e["_eventNumber"])
-                bare = [[{k: v for k, v in e.items() if k not in RUN} for e in those] for those in (expected, got)]
-                self.assertEqual(*bare, (seed, i, key, session))
-                self.assertEqual([{k for k in e if e[k] is None} for e in expected], [RUN & set(e) for e in got])
-                events += len(got)
-        self.assertGreater(events, bags * sessions / 4)
+    def test_differences_of_messages(self):
+        lines = [{"event": "message", "message": 4, "from": "client", "clientType": 7, "client": "phone", "category": 5, "type": 1,
+                  "payload": {"peer": "x", "number": "1"}, "userInfo": {"clientName": "phone"}, "storebag": {"section": "release"}},
+                 {"event": "step", "message": 4, "backend": "httppost", "step": "posted"},
+                 {"event": "message", "message": 5, "clientType": 7, "client": "lamp", "category": 5, "type": 1, "payload": {}},
+                 {"op": "send", "category": 6, "type": 1, "payload": {"number": "1"}}]
+        recorded = self.file("recorded", "".join(json.dumps(line) + "\n" for line in lines))
+        old = self.file("old", bag(client="phone", filters=[{"key": "peer", "action": "remove"}, {"key": "number", "action": "sha256"}]))
+        new = self.file("new", bag(client="phone", post_url="https://d.example/e"))
+        options = ("--messages", recorded, "--country", "US", "--consent", "yes", "--draw", "0.4")
+        status, text, _ = run("diff", "--json", *options, old, new)
+        self.assertEqual((status, json.loads(text)["messages"]), (1, {"total": 3, "changed": 2, "list": [
+            {"line": 1, "was": "httppost: posted to https://c.example/e, without peer, with hashed number",
+             "is": "httppost: posted to https://d.example/e, without peer"},
+            {"line": 4, "was": "httppost: posted to https://c.example/e", "is": "httppost: posted to https://d.example/e"}]}))
+        self.assertIn("2 of 3 messages have another fate", run("diff", *options, old, new)[1])
+        status, text, _ = run("diff", "--json", "--messages", recorded, old, "-", given=old.read_text())
+        self.assertEqual((status, json.loads(text)), (0, {"changes": [], "messages": {"total": 3, "changed": 0, "list": []}}))
 
 
 if __name__ == "__main__":

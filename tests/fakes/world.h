@@ -3,25 +3,14 @@
 // above.
 #pragma once
 
-#include "backends/ampery/energy_log.h"
-#include "backends/backend_factory.h"
-#include "backends/dashboard/work_pool.h"
-#include "backends/mivo/code_bundle.h"
-#include "config/operator_settings.h"
-#include "config/process_settings.h"
+#include "backends/standalone_services.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/fake_http_client.h"
 #include "fakes/machine.h"
-#include "platform/counters.h"
-#include "platform/lent_files.h"
-#include "platform/root.h"
-#include "support/device_identity.h"
-#include "support/veltra.h"
 
 namespace veltrad {
 
-// Its 19 fields are the services in the order in which they need each other.
-struct World {
+struct FakeMachine {
   FakeHTTPClient http;
   FakeClock clock;
   FakeRandom random;
@@ -29,20 +18,10 @@ struct World {
   FakePreferences preferences;
   FakeDeviceProperties properties;
   FakeFileStore files;
-  platform::Counters counters;
-  backends::EnergyLog energyLog{clock, counters, "/nowhere/energy.jsonl"};
-  backends::CodeBundle adaptorBundle{"/nowhere", "none"};
-  backends::WorkPool pool;
-  platform::LentFiles lentFiles;
-  platform::Root root{"/"};
-  support::DeviceIdentity device{properties};
-  config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
-  config::OperatorSettings choices{files, root.settingsPath()};
-  support::Veltra library{files, preferences, root};
-  const backends::BackendServices services{http,     clock,     random,        locale,   preferences,
-                                           counters, energyLog, adaptorBundle, settings, choices,
-                                           device,   library,   pool,          lentFiles};
-  backends::BackendFactory factory{services};
+};
+
+struct World : FakeMachine, backends::StandaloneServices {
+  World() : StandaloneServices({http, clock, random, locale, preferences, properties, files}) {}
 };
 
 }  // namespace veltrad

@@ -11,17 +11,17 @@ namespace veltrad::platform {
 namespace {
 
 using Text = std::optional<std::string>;
-constexpr const char* kList = "/root/etc/veltrad/device.plist";
+constexpr const char* kDeviceList = "/root/etc/veltrad/device.plist";
 
 class MachinePropertiesTest : public ::testing::Test {
  protected:
-  void put(const Dictionary& list) { _files.put(kList, formats::writeXMLPropertyList(list)); }
+  void put(const Dictionary& list) { _files.put(kDeviceList, formats::writeXMLPropertyList(list)); }
 
   Text value(std::string_view key) { return _properties.value(key).value(); }
 
   RecordedLog _log;
   FakeFileStore _files;
-  platform::MachineProperties _properties{_files, kList};
+  platform::MachineProperties _properties{_files, kDeviceList};
 };
 
 TEST_F(MachinePropertiesTest, TheListComesFirstAndAnEmptyTextMeansNoValue) {
@@ -44,14 +44,14 @@ TEST_F(MachinePropertiesTest, DuringAShortageWhatWasLastReadServesOrNothing) {
   _files.put("/usr/lib/os-release", "VERSION_ID=13\n");
   _files.put("/etc/os-release", "VERSION_ID=12\n");
   for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName"}) {
-    for (const char* path : {kList, "/etc/os-release", "/proc/cpuinfo"})
+    for (const char* path : {kDeviceList, "/etc/os-release", "/proc/cpuinfo"})
       _files.failReads(path, platform::FileFailure::Kind::shortage);
     EXPECT_FALSE(_properties.value(key)) << key;
-    _files.failReads(kList, {});
+    _files.failReads(kDeviceList, {});
     EXPECT_EQ(_properties.value(key).ok(), key == std::string("SerialNumber")) << key;
     for (const char* path : {"/etc/os-release", "/proc/cpuinfo"}) _files.failReads(path, {});
   }
-  platform::MachineProperties properties{_files, kList};
+  platform::MachineProperties properties{_files, kDeviceList};
   const auto all = [&] {
     std::string texts;
     for (const char* key : {"SerialNumber", "ProductVersion", "DeviceName", "BuildVersion"})

@@ -10,7 +10,7 @@
 namespace veltrad::platform {
 namespace {
 
-using Kind = LocalContent::Kind;
+using Read = LocalContent::Kind;
 constexpr const char* kJSON = "/etc/x.json";
 constexpr const char* kList = "/etc/x.plist";
 
@@ -22,30 +22,30 @@ TEST(LocalSettings, SayWhatTheFileHoldsOrThePlaceWhereItIsBroken) {
   const std::string both = "/etc/x.json and /etc/x.plist: both are there, the first counts";
   const struct {
     std::string json, list;  // empty: no such file
-    Kind kind;
+    Read kind;
     Value value;
     std::string said;  // the error, or else the warning
-  } table[] = {{"", "", Kind::absent, false, ""},
-               {"// a comment\n{ /* another // one\n*/ \"a\": 1 } // at the end", "", Kind::good,
+  } table[] = {{"", "", Read::absent, false, ""},
+               {"// a comment\n{ /* another // one\n*/ \"a\": 1 } // at the end", "", Read::good,
                 Dictionary{{"a", 1}}, ""},
-               {"[{\"$date\": 1.5}, {\"$data\": \"AAE=\"}, \"//\"]", "", Kind::good,
+               {"[{\"$date\": 1.5}, {\"$data\": \"AAE=\"}, \"//\"]", "", Read::good,
                 Array{Date{1.5}, Data{std::string("\0\1", 2)}, "//"}, ""},
-               {"", plist("<array><true/></array>"), Kind::good, Array{true}, ""},
-               {"", writeBinaryPropertyList(Array{5}), Kind::good, Array{5}, ""},
-               {"[1]", plist("<true/>"), Kind::good, Array{1}, both},
-               {"{\"a\" 1}", "", Kind::broken, false,
+               {"", plist("<array><true/></array>"), Read::good, Array{true}, ""},
+               {"", writeBinaryPropertyList(Array{5}), Read::good, Array{5}, ""},
+               {"[1]", plist("<true/>"), Read::good, Array{1}, both},
+               {"{\"a\" 1}", "", Read::broken, false,
                 "/etc/x.json:1:6: Missing a colon after a name of object member."},
-               {"{\n  \"é\": 1,\n  \"é\" 1}", plist("<true/>"), Kind::broken, false,
+               {"{\n  \"é\": 1,\n  \"é\" 1}", plist("<true/>"), Read::broken, false,
                 "/etc/x.json:3:7: Missing a colon after a name of object member."},
-               {"[1,]", "", Kind::broken, false, "/etc/x.json:1:4: Invalid value."},
-               {"[1 /* no end", "", Kind::broken, false, "/etc/x.json:1:13: Unspecific syntax error."},
-               {"[1]\n\n x", "", Kind::broken, false,
+               {"[1,]", "", Read::broken, false, "/etc/x.json:1:4: Invalid value."},
+               {"[1 /* no end", "", Read::broken, false, "/etc/x.json:1:13: Unspecific syntax error."},
+               {"[1]\n\n x", "", Read::broken, false,
                 "/etc/x.json:3:2: The document root must not be followed by other values."},
-               {"", plist("<array>\n  <true/>\n  <null/>\n</array>"), Kind::broken, false,
+               {"", plist("<array>\n  <true/>\n  <null/>\n</array>"), Read::broken, false,
                 "/etc/x.plist:5:3: unknown element <null>"},
-               {"", plist("<array><true/>"), Kind::broken, false, "/etc/x.plist:3:17: mismatched tag"},
-               {"", "bplist00", Kind::broken, false, "/etc/x.plist:1:1: "},
-               {"", "rubbish", Kind::broken, false,
+               {"", plist("<array><true/>"), Read::broken, false, "/etc/x.plist:3:17: mismatched tag"},
+               {"", "bplist00", Read::broken, false, "/etc/x.plist:1:1: "},
+               {"", "rubbish", Read::broken, false,
                 "/etc/x.plist:1:1: neither \"bplist00\" nor XML at its beginning"}};
   for (const auto& c : table) {
     FakeFileStore files;
@@ -55,7 +55,7 @@ TEST(LocalSettings, SayWhatTheFileHoldsOrThePlaceWhereItIsBroken) {
       const auto content = LocalSettings(files, path).content().value();
       EXPECT_EQ(content->kind, c.kind) << c.json << c.list;
       EXPECT_TRUE(content->value == c.value) << c.json << c.list;
-      const std::string said = content->kind == Kind::broken ? content->error : content->warning.value_or("");
+      const std::string said = content->kind == Read::broken ? content->error : content->warning.value_or("");
       EXPECT_EQ(said.substr(0, c.said.size()), c.said);
       EXPECT_EQ(said.empty(), c.said.empty()) << said;
     }
@@ -88,7 +88,7 @@ TEST(LocalSettings, AreOneContentUntilItChangesAndNoShortageChangesIt) {
   files.failReads(kJSON, {});
   files.remove(kJSON);
   files.remove(kList);
-  EXPECT_EQ(settings.content().value()->kind, Kind::absent);
+  EXPECT_EQ(settings.content().value()->kind, Read::absent);
 }
 
 TEST(LocalSettings, NameThePlacesOfKeysAndElementsInJSON) {

@@ -3,10 +3,16 @@
 // record.
 #include "support/history.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <random>
 
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
@@ -87,14 +93,14 @@ TEST_F(HistoryTest, KeepsTheNewestWithinItsBytesAndDays) {
   _space = {2, 65'536};
   restart();
   for (int day = 0; day < 3; ++day) {
-    for (int i = 0; i < 30; ++i) {
-      add(std::string(4000, static_cast<char>('a' + i)));
+    for (int writes = 0; writes < 6; ++writes) {
+      for (int i = 0; i < 4; ++i) add(std::string(4000, static_cast<char>('a' + i)));
       ASSERT_TRUE(write());
       const auto days = HistoryFolder::days(_history->directory());
       std::uint64_t bytes = 0;
       for (const auto& [name, size] : days) bytes += size;
       EXPECT_LE(bytes, _space.bytes);
-      EXPECT_GE(bytes, i < 15 && day == 0 ? 0 : _space.bytes * 3 / 4);
+      EXPECT_GE(bytes, _count < 16 ? 0 : _space.bytes * 3 / 4);
       EXPECT_LE(days.size(), 2u);
       EXPECT_EQ(records(today()).back().first, _count);
     }
@@ -134,6 +140,71 @@ TEST_F(HistoryTest, WhatTheDiskDoesNotTakeWaitsAndLeavesNoRoom) {
   ASSERT_TRUE(write());
   EXPECT_TRUE(_history->hasRoom());
   EXPECT_EQ(records(today()).size(), 4u);
+}
+
+// Of any length up to more than is written in one call.
+std::string bodyOf(int number) {
+  return std::string(std::size_t(number) * 7919 % 600'000, static_cast<char>('a' + number % 26));
+}
+
+// Writes three records at a time, and says the number of the last one that is on disk.
+[[noreturn]] void writeUntilKilled(const std::string& directory, std::int64_t bytes, int number, int to) {
+  FakeClock clock;
+  platform::DiskWriter writer;
+  support::History history(clock, directory, writer);
+  history.keep(support::HistorySpace{7, static_cast<std::uint64_t>(bytes)});
+  history.mend();
+  for (;;) {
+    for (int i = 0; i < 3; ++i, ++number) history.begins({{"n", number}}, {bodyOf(number), nullptr, 0});
+    const int last = number - 1;
+    const bool written = history.writeNow(std::chrono::steady_clock::now() + 20s);
+    if (!written || ::write(to, &last, sizeof last) != sizeof last) ::_exit(1);
+  }
+}
+
+// VELTRA_ROUNDS says how often it is killed (8).
+TEST(HistoryKilled, LosesNothingThatWasSyncedAndShowsNothingTorn) {
+  constexpr std::int64_t kBytes = 8 << 20;
+  const char* given = std::getenv("VELTRA_ROUNDS");
+  const TemporaryDirectory directory;
+  const std::string path = HistoryFolder::pathOf(directory.path(), FakeClock().now().seconds / 86'400);
+  std::mt19937 dice(std::random_device{}());
+  int last = 0;
+  std::uint64_t cut = 0;
+  for (int round = given ? std::atoi(given) : 8; round > 0; --round) {
+    int ends[2];
+    ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+    const FileDescriptor said(ends[0]);
+    const pid_t child = ::fork();
+    if (child == 0) {
+      ::alarm(60);
+      writeUntilKilled(directory.path(), kBytes, last + 1, ends[1]);
+    }
+    ::close(ends[1]);
+    int synced = last;
+    const auto hears = [&] { return ::read(said.get(), &synced, sizeof synced) == sizeof synced; };
+    for (unsigned writes = 1 + dice() % 3; writes > 0; --writes) ASSERT_TRUE(hears());
+    ::usleep(dice() % 10'000);  // at any moment of a write
+    ::kill(child, SIGKILL);
+    ::waitpid(child, nullptr, 0);
+    while (hears()) {
+    }
+    cut += HistoryFolder(directory.path()).mend();
+    const HistoryFile file(path);
+    int next = 0;
+    for (auto place = file.at(0); place; place = file.at(place->end())) {
+      ASSERT_TRUE(file.isIntact(*place));
+      const int number = file.header(*place)->int32("n").value_or(-1);
+      ASSERT_TRUE(next == 0 || number == next) << number;
+      ASSERT_EQ(file.body(*place, 0, 1u << 20), bodyOf(number)) << number;
+      next = number + 1;
+    }
+    last = next - 1;
+    ASSERT_GE(last, synced);
+    ASSERT_LE(file.size(), std::uint64_t(kBytes) + 3 * 600'100);
+  }
+  std::printf("%d records, %llu bytes of unfinished ones cut off\n", last,
+              static_cast<unsigned long long>(cut));
 }
 
 }  // namespace

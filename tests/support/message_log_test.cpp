@@ -112,6 +112,26 @@ TEST_F(MessageLogTest, WhatCannotBeWrittenIsDeletedAndTheNextMessageBeginsAnew) 
   EXPECT_EQ(_place.read("elsewhere"), "foreign");
 }
 
+TEST_F(MessageLogTest, LinesThatWaitAreWrittenTogetherInTheirOrder) {
+  for (const auto& [seconds, text] : {std::pair{1416168834, "2014-11-16 20:13:54 +0000"},
+                                      {951782400, "2000-02-29 00:00:00 +0000"},
+                                      {1735689599, "2024-12-31 23:59:59 +0000"}}) {
+    EXPECT_EQ(support::dateDescription(seconds + 0.9), text);
+  }
+  platform::DiskWriter::Queue other(_writer, 1);
+  std::latch begun(1), stalled(1);
+  other.put([&] { begun.count_down(), stalled.wait(); }, 1);
+  begun.wait();
+  std::string expected;
+  for (int i = 0; i < 150; ++i) {
+    _messages.writeToLogFile("%@", std::to_string(i));
+    expected += dateAt(_now) + std::to_string(i) + "\n";
+  }
+  stalled.count_down();
+  write();
+  EXPECT_EQ(_place.read(nameAt(_now)), expected + _line);
+}
+
 TEST_F(MessageLogTest, NobodyWaitsForADiskThatDoesNotAnswer) {
   platform::DiskWriter::Queue other(_writer, 1);
   std::latch begun(1), stalled(1);

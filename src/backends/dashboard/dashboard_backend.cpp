@@ -159,11 +159,10 @@ DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::str
       _postURL(profile ? profile->postURL : std::nullopt),
       _gate(making.gate) {}
 
-DatagramOwner DashboardBackend::owner(const MessageNote& note) const {
-  const auto facts = this->facts();
-  if (!_gate || !_gate->keepsRecords()) return {facts->client, {}};
-  return {facts->client,
-          aboutDeparture(name(), *facts, std::nullopt, note.edits ? *note.edits : config::EditedFields())};
+DatagramOwner DashboardBackend::owner(const MessageNote& note, const SessionFacts& facts) const {
+  if (!_gate || !_gate->keepsRecords()) return {facts.client, {}};
+  return {facts.client,
+          aboutDeparture(name(), facts, std::nullopt, note.edits ? *note.edits : config::EditedFields())};
 }
 
 std::vector<std::string> DashboardBackend::hosts() const {
@@ -183,8 +182,9 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
     _counters.count(wire::Reason::backend_disabled);
     return settled(message, {wire::Fate::dropped, *forbidden});
   }
+  const SharedFacts facts = this->facts();
   tagReportingPacket packet;
-  packet.header = headerOf(message);
+  packet.header = headerOf(message, *facts);
   PacketText text(packet.text);
   if (message.payload) text.append(*message.payload);
   if (text.cut()) _counters.count(wire::Reason::datagram_cut);
@@ -194,24 +194,24 @@ Sent DashboardBackend::sendNumberedMessage(NumberedMessage&& message) {
   std::string line = writeLocalLog(packet);
   const std::string_view datagram{reinterpret_cast<const char*>(&packet), length};
   wire::StepEntry fate = stepOf(message);
-  fate.text = pen().textOf(_networkProcQueue->address());
+  fate.text = pen().textOf(_networkProcQueue->address(), _addressAt);
   fate.bytes = static_cast<std::uint32_t>(length);
-  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note), fate),
+  return {_networkProcQueue->tryToSendMsg(datagram, message.eventID, owner(message.note, *facts), fate),
           std::move(line)};
 }
 
-tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message) const {
-  const auto facts = this->facts();
-  const std::string& udid = facts->device.udid;
+tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& message,
+                                                    const SessionFacts& facts) const {
+  const std::string& udid = facts.device.udid;
   const platform::TimeValue time = message.timestamp;
   tagReportingPacketHeader header{};
-  header.versionMajor = facts->selfVersion.major;
-  header.componentType = static_cast<std::uint8_t>(facts->compType);
+  header.versionMajor = facts.selfVersion.major;
+  header.componentType = static_cast<std::uint8_t>(facts.compType);
   header.kind = kPacketKind;
   header.timeFraction = static_cast<std::uint8_t>(time.microseconds / kMicrosecondsPerFraction);
   header.seconds = htobe32(static_cast<std::uint32_t>(time.seconds));
-  header.invertedSessionID = htobe32(~facts->sessionID);
-  header.invertedClientVersion = htobe16(static_cast<std::uint16_t>(~facts->clientVersion));
+  header.invertedSessionID = htobe32(~facts.sessionID);
+  header.invertedClientVersion = htobe16(static_cast<std::uint16_t>(~facts.clientVersion));
   header.method = htobe16(message.method);
   header.respCode = htobe16(message.respCode);
   std::memcpy(header.deviceID, udid.data(), std::min(udid.size(), sizeof header.deviceID));
@@ -223,23 +223,23 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
 }
 
 bool DashboardBackend::uploadLogData(const Array& logData, const MessageNote& note) {
-  wire::StepEntry fate;
-  fate.message = note.number;
+  const wire::StepEntry fate = stepOf(note);
   if (prohibition()) {
     _counters.count(wire::Reason::log_data_refused_by_owner);
     pen().write(wire::Step::dropped, wire::Reason::log_data_refused_by_owner, fate);
     return false;
   }
-  const auto location = _uploads.upload(_postURL, logData, owner(note), pen(), fate);
+  const auto location = _uploads.upload(_postURL, logData, owner(note, *facts()), pen(), fate);
   if (!location) return false;
   const Dictionary payload{{"LogDataUploadLocation", *location}};
   const platform::TimeValue now = _clock.now();
-  sendMessage(payload, now, 0, 2, 0, notedMessage(now, note.session));
+  sendMessage(payload, now, 0, 2, 0, notedMessage(payload, now, note.session));
   return true;
 }
 
 // The message is of this back end alone.
-MessageNote DashboardBackend::notedMessage(platform::TimeValue now, wire::FateRef session) const {
+MessageNote DashboardBackend::notedMessage(const Dictionary& payload, platform::TimeValue now,
+                                           wire::FateRef session) const {
   if (!pen().writes()) return {};
   wire::MessageEntry entry;
   entry.from = wire::MessageEntry::From::session;
@@ -247,6 +247,7 @@ MessageNote DashboardBackend::notedMessage(platform::TimeValue now, wire::FateRe
   entry.message = pen().ring()->nextMessage();
   entry.time = platform::FateRing::microseconds(now);
   entry.type = 2;
+  pen().ring()->contents().keep(entry.message, &payload, nullptr);
   pen().ring()->write(entry);
   return {nullptr, entry.message, session};
 }

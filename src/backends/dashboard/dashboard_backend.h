@@ -69,9 +69,9 @@ class DashboardBackend final : public VeltraBackend {
   DashboardBackend(const DashboardMaking& making, const std::string& name,
                    const config::DashboardProfile* profile, const std::string& productFamily);
 
-  tagReportingPacketHeader headerOf(const NumberedMessage& message) const;
-  MessageNote notedMessage(platform::TimeValue now, wire::FateRef session) const;
-  DatagramOwner owner(const MessageNote& note) const;
+  tagReportingPacketHeader headerOf(const NumberedMessage& message, const SessionFacts& facts) const;
+  MessageNote notedMessage(const Dictionary& payload, platform::TimeValue now, wire::FateRef session) const;
+  DatagramOwner owner(const MessageNote& note, const SessionFacts& facts) const;
 
   LogDataUploads& _uploads;
   platform::Clock& _clock;
@@ -83,6 +83,7 @@ class DashboardBackend final : public VeltraBackend {
 
   // The session's thread only.
   bool _cleanedUp = false;
+  std::uint64_t _addressAt = 0;  // in the record of fates
 };
 
 }  // namespace veltrad::backends

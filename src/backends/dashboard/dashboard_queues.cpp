@@ -9,21 +9,50 @@
 
 namespace veltrad::backends {
 
+namespace {
+bool isSame(const std::weak_ptr<NetworkProcQueue>& one, const std::shared_ptr<NetworkProcQueue>& other) {
+  return !one.owner_before(other) && !other.owner_before(one);
+}
+}  // namespace
+
 std::shared_ptr<NetworkProcQueue> DashboardQueues::join(const Route& route) {
-  std::shared_ptr<NetworkProcQueue> queue;
-  {
-    const Lock held(_mutex);
-    const auto found = _shared.find(route);
-    if (found != _shared.end()) queue = found->second.lock();
-    if (queue) forget(queue);
+  const auto queues = sharedOn(route);
+  for (const bool alone : {true, false}) {
+    if (!alone && queues.size() < kMostShared) return nullptr;
+    for (const auto& queue : queues) {
+      if (!queue->join(alone)) continue;
+      joined(route, queue);
+      return queue;
+    }
   }
-  return queue && queue->join() ? queue : nullptr;
+  return nullptr;
+}
+
+std::vector<std::shared_ptr<NetworkProcQueue>> DashboardQueues::sharedOn(const Route& route) {
+  std::vector<std::shared_ptr<NetworkProcQueue>> queues;
+  const Lock held(_mutex);
+  const auto found = _shared.find(route);
+  if (found == _shared.end()) return queues;
+  for (const auto& one : found->second) {
+    if (auto queue = one.lock()) queues.push_back(std::move(queue));
+  }
+  return queues;
+}
+
+void DashboardQueues::joined(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue) {
+  const Lock held(_mutex);
+  forget(queue);
+  auto& queues = _shared[route];
+  const auto place =
+      std::find_if(queues.begin(), queues.end(), [&queue](const auto& one) { return isSame(one, queue); });
+  if (place != queues.end()) queues.splice(queues.end(), queues, place);
 }
 
 void DashboardQueues::share(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue) {
   const Lock held(_mutex);
-  std::erase_if(_shared, [](const auto& entry) { return entry.second.expired(); });
-  _shared[route] = queue;
+  for (auto& [other, queues] : _shared) std::erase_if(queues, [](const auto& one) { return one.expired(); });
+  std::erase_if(_shared, [](const auto& entry) { return entry.second.empty(); });
+  _shared[route].push_back(queue);
 }
 
 void DashboardQueues::lingers(const std::shared_ptr<NetworkProcQueue>& queue, std::int64_t user) {
@@ -55,7 +84,9 @@ void DashboardQueues::dropWaiting(const std::function<bool(const std::string& ho
   {
     const Lock held(_mutex);
     for (const Lingering& one : _lingering) queues.push_back(one.queue.lock());
-    for (const auto& [route, queue] : _shared) queues.push_back(queue.lock());
+    for (const auto& [route, shared] : _shared) {
+      for (const auto& queue : shared) queues.push_back(queue.lock());
+    }
   }
   for (const auto& queue : queues) {
     if (queue && refuses(queue->host())) queue->dropWaiting();
@@ -65,10 +96,8 @@ void DashboardQueues::dropWaiting(const std::function<bool(const std::string& ho
 // Removes the queue, and those that have ended. Takes no reference, because releasing the last one under the
 // lock would destroy a queue there.
 void DashboardQueues::forget(const std::shared_ptr<NetworkProcQueue>& queue) {
-  std::erase_if(_lingering, [&queue](const Lingering& one) {
-    const bool same = !one.queue.owner_before(queue) && !queue.owner_before(one.queue);
-    return same || one.queue.expired();
-  });
+  std::erase_if(_lingering,
+                [&queue](const Lingering& one) { return isSame(one.queue, queue) || one.queue.expired(); });
 }
 
 std::shared_ptr<NetworkProcQueue> DashboardQueues::takeOneTooMany(std::int64_t user) {

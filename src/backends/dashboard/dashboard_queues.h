@@ -14,6 +14,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "base/mutex.h"
 #include "platform/memory_budget.h"
@@ -28,6 +29,8 @@ class DashboardQueues {
  public:
   static constexpr std::size_t kMostOfUser = 64;
   static constexpr std::size_t kMost = 256;
+  // For one-shot messages on one route.
+  static constexpr std::size_t kMostShared = 16;
   // Stands for an unknown user.
   static constexpr std::int64_t kNobody = -1;
 
@@ -45,10 +48,11 @@ class DashboardQueues {
     auto operator<=>(const Route&) const = default;
   };
 
-  // Returns the queue for one-shot messages on this route, to which one more back end is then connected. Null
-  // if there is none.
+  // Returns a queue for a one-shot message on this route, to which one more back end is then connected: one
+  // that awaits no acknowledgement, because all one-shot messages have the same number. Null if there is
+  // none, and room for another; without room one that waits for others, too.
   std::shared_ptr<NetworkProcQueue> join(const Route& route);
-  // From now on join() finds this queue.
+  // From now on join() finds this queue, too.
   void share(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue);
   // Registers a queue that waits without a back end. If the user, or all together, have too many such queues,
   // the oldest one is ended.
@@ -64,13 +68,18 @@ class DashboardQueues {
     std::int64_t user;
   };
   void forget(const std::shared_ptr<NetworkProcQueue>& queue) REQUIRES(_mutex);
+  // Those on this route that have not ended, the one that was joined longest ago first.
+  std::vector<std::shared_ptr<NetworkProcQueue>> sharedOn(const Route& route);
+  // This one was joined.
+  void joined(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue);
   // Removes the oldest queue of the user, or of all, if there are too many. Null if there is room.
   std::shared_ptr<NetworkProcQueue> takeOneTooMany(std::int64_t user) REQUIRES(_mutex);
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   // Oldest first.
   std::list<Lingering> _lingering GUARDED_BY(_mutex);
-  std::map<Route, std::weak_ptr<NetworkProcQueue>> _shared GUARDED_BY(_mutex);
+  // The one that was joined longest ago first.
+  std::map<Route, std::list<std::weak_ptr<NetworkProcQueue>>> _shared GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::backends

@@ -30,7 +30,7 @@ MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder re
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                                                std::optional<platform::Charge> charge,
                                                const DatagramOwner& owner, std::uint64_t message) {
-  const bool sent = _send(datagram);
+  const bool sent = _send(datagram, true) == Sending::done;
   const std::uint64_t record = sent ? recordSent(datagram, owner) : 0;
   First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt, 0, false};
   const bool waits = !sent || _reliableUDP;
@@ -64,15 +64,26 @@ MessageQueue::Tick MessageQueue::tick() {
   return result;
 }
 
-bool MessageQueue::send(const UDPPacketToSend& record) {
-  if (!_send(record.data)) return false;
-  if (_copies && _reliableUDP) _copies->sent(record.serial, record.eventNumber);
+MessageQueue::Sending MessageQueue::send(const UDPPacketToSend& record) {
+  const Sending result = _send(record.data, false);
+  if (result == Sending::done && _copies && _reliableUDP) _copies->sent(record.serial, record.eventNumber);
+  return result;
+}
+
+bool MessageQueue::forbid(const UDPPacketToSend& record, Tick& result) {
+  const bool sent = record.state != UDPPacketToSend::notSent;
+  ++result.forbidden;
+  _tell(record.message, sent ? wire::Step::given_up : wire::Step::dropped,
+        wire::Reason::datagram_over_daily_limit);
+  recordEnd(record, kNotAcknowledged);
   return true;
 }
 
 bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (record.state == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
-  if (!send(record)) return false;
+  const Sending sending = send(record);
+  if (sending == Sending::forbidden) return forbid(record, result);
+  if (sending == Sending::notTaken) return false;
   ++result.sent;
   _tell(record.message, wire::Step::sent, wire::Reason::datagram_sent);
   record.state = UDPPacketToSend::awaitsAcknowledgement;
@@ -91,12 +102,15 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
   const int checks = record.numberOfChecks + 1;
   if (checks < checksBeforeRetransmit[record.numberOfRetransmits]) {
     record.numberOfChecks = checks;
-  } else if (send(record)) {
-    record.numberOfChecks = 0;
-    ++record.numberOfRetransmits;
-    ++result.sentAgain;
-    _tell(record.message, wire::Step::again, wire::Reason::datagram_sent_again);
+    return false;
   }
+  const Sending sending = send(record);
+  if (sending == Sending::forbidden) return forbid(record, result);
+  if (sending == Sending::notTaken) return false;
+  record.numberOfChecks = 0;
+  ++record.numberOfRetransmits;
+  ++result.sentAgain;
+  _tell(record.message, wire::Step::again, wire::Reason::datagram_sent_again);
   return false;
 }
 
@@ -123,16 +137,18 @@ std::size_t MessageQueue::notSent() const {
                     [](const UDPPacketToSend& record) { return record.state == UDPPacketToSend::notSent; }));
 }
 
-bool MessageQueue::acknowledge(std::uint16_t eventNumber) {
+std::optional<wire::Reason> MessageQueue::acknowledge(std::uint16_t eventNumber) {
   const auto answered = _copies ? _copies->answered(eventNumber) : std::nullopt;
   const auto record = std::find_if(_pending.begin(), _pending.end(), [&](const UDPPacketToSend& one) {
-    return _copies ? answered == one.serial : one.eventNumber == eventNumber;
+    return _copies ? answered && answered->datagram == one.serial : one.eventNumber == eventNumber;
   });
-  if (record == _pending.end()) return false;
-  _tell(record->message, wire::Step::acknowledged, wire::Reason::datagram_acknowledged);
+  if (record == _pending.end()) return std::nullopt;
+  const auto how = answered && !answered->certain ? wire::Reason::acknowledged_by_number
+                                                  : wire::Reason::datagram_acknowledged;
+  _tell(record->message, wire::Step::acknowledged, how);
   recordEnd(*record, "");
   _pending.erase(record);
-  return true;
+  return how;
 }
 
 }  // namespace veltrad::backends

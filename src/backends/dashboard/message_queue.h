@@ -18,15 +18,17 @@ namespace veltrad::backends {
 
 // A datagram that could not be sent whole waits for the next tick. With reliable UDP every other datagram
 // waits for its acknowledgement; until that comes, it is sent again on the 2nd, 5th, 10th and 19th tick, and
-// given up on the 20th.
+// given up on the 20th, or when it may not be sent again.
 class MessageQueue {
  public:
   // For one back end.
   static constexpr std::size_t maxPendingPackets = 50;
-  // For all one-shot messages to one dashboard.
+  // For all one-shot messages that share a socket.
   static constexpr std::size_t maxPendingSharedPackets = 1024;
-  // Returns whether all bytes were sent.
-  using Send = std::function<bool(std::string_view datagram)>;
+  // notTaken: not all bytes were sent. forbidden: by the owner's limit for the day.
+  enum class Sending { done, notTaken, forbidden };
+  // `first`: it has not been tried before; then nothing forbids it.
+  using Send = std::function<Sending(std::string_view datagram, bool first)>;
   // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
   // or acknowledged.
   using Tell = std::function<void(std::uint64_t message, wire::Step step, wire::Reason reason)>;
@@ -45,11 +47,13 @@ class MessageQueue {
     std::uint64_t pushedOutMessage = 0;
     bool pushedOutSent = false;
   };
-  // How many datagrams were sent for the first time, sent again and given up.
+  // How many datagrams were sent for the first time, sent again, given up, and removed because they were
+  // forbidden.
   struct Tick {
     std::size_t sent = 0;
     std::size_t sentAgain = 0;
     std::size_t givenUp = 0;
+    std::size_t forbidden = 0;
   };
 
   // `shared`: by one-shot messages, each of which has its own back end, which starts at event number 1.
@@ -62,9 +66,11 @@ class MessageQueue {
                      std::optional<platform::Charge> charge, const DatagramOwner& owner = {},
                      std::uint64_t message = 0);
   Tick tick();
-  // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. False
-  // if there is none.
-  bool acknowledge(std::uint16_t eventNumber);
+  // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. Returns
+  // how it was acknowledged, or nothing if there is none.
+  std::optional<wire::Reason> acknowledge(std::uint16_t eventNumber);
+  // Nothing waits, and no acknowledgement can come that would be taken for that of the next datagram.
+  bool idle() const { return _pending.empty() && (!_copies || _copies->empty()); }
   // Calls `drop` for each one that waits, and forgets it.
   void clear(const std::function<void(const UDPPacketToSend&)>& drop = {});
 
@@ -76,8 +82,9 @@ class MessageQueue {
   std::size_t notSent() const;
 
  private:
-  bool send(const UDPPacketToSend& record);
+  Sending send(const UDPPacketToSend& record);
   // These return true if the record is to be removed.
+  bool forbid(const UDPPacketToSend& record, Tick& result);
   bool check(UDPPacketToSend& record, Tick& result);
   bool checkAcknowledgement(UDPPacketToSend& record, Tick& result);
   std::uint64_t recordSent(std::string_view datagram, const DatagramOwner& owner) const;

@@ -49,9 +49,11 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _socket(std::move(socket)),
       _messageQueue(
           kind.reliableUDP, kind.shared,
-          [this](std::string_view datagram) REQUIRES(_mutex) {
-            const bool room = !_kind.gate || _kind.gate->hasRoomForRecord();
-            return room && mayLeave(0, datagram.size()) && _socket.send(datagram);
+          [this](std::string_view datagram, bool first) REQUIRES(_mutex) {
+            using Sending = MessageQueue::Sending;
+            if (_kind.gate && !_kind.gate->hasRoomForRecord()) return Sending::notTaken;
+            if (!first && !mayLeave(0, datagram.size())) return Sending::forbidden;
+            return _socket.send(datagram) ? Sending::done : Sending::notTaken;
           },
           recorder(),
           [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
@@ -82,8 +84,7 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
     _kind.pen.write(wire::Step::dropped, wire::Reason::ended_before_sent, fate);
     return {wire::Fate::dropped, wire::Reason::ended_before_sent};
   }
-  // Its bytes are counted with each transmission.
-  if (!mayLeave(1, 0)) {
+  if (!mayLeave(1, datagram.size())) {
     _counters.count(wire::Reason::datagram_over_daily_limit);
     _kind.pen.write(wire::Step::dropped, wire::Reason::datagram_over_daily_limit, fate);
     return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
@@ -94,7 +95,7 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
   if (first.fate == wire::Reason::no_memory_to_await) _counters.count(wire::Reason::datagram_sent);
   _counters.count(first.fate);
   if (first.pushedOut) _counters.count(*first.pushedOut);
-  if (!_armed) armTimer(now());
+  if (!_armed && !_messageQueue.empty()) armTimer(now());
   return decisionOf(first.fate, _kind.reliableUDP);
 }
 
@@ -150,9 +151,10 @@ std::optional<platform::Charge> NetworkProcQueue::chargeFor(std::size_t datagram
   return _kind.reliableUDP ? _account->keep(bytes) : _account->tryCharge(bytes, platform::MemoryUse::kept);
 }
 
-bool NetworkProcQueue::join() {
+bool NetworkProcQueue::join(bool alone) {
   const Lock held(_mutex);
   if (!_timer) return false;
+  if (alone && _kind.reliableUDP && (_backEnds > 0 || !_messageQueue.idle())) return false;
   ++_backEnds;
   _schedule.resume();
   return true;
@@ -230,6 +232,7 @@ void NetworkProcQueue::myPeriodicTask(DeliverySchedule::Time time) {
   _counters.count(wire::Reason::datagram_sent, tick.sent);
   _counters.count(wire::Reason::datagram_sent_again, tick.sentAgain);
   _counters.count(wire::Reason::never_acknowledged, tick.givenUp);
+  _counters.count(wire::Reason::datagram_over_daily_limit, tick.forbidden);
   switch (_schedule.afterTick(time, !_messageQueue.empty())) {
     case DeliverySchedule::Verdict::stop:
       logDebug("DashboardBackend(myPeriodicTask): clean up at myPeriodicTask.");
@@ -268,8 +271,8 @@ bool NetworkProcQueue::processSocketRead() {
     return true;
   }
   std::memcpy(&eventNumber, datagram + kEventIDAt, sizeof eventNumber);
-  const bool known = _messageQueue.acknowledge(be16toh(eventNumber));
-  _counters.count(known ? wire::Reason::datagram_acknowledged : wire::Reason::acknowledgement_unknown);
+  const auto how = _messageQueue.acknowledge(be16toh(eventNumber));
+  _counters.count(how.value_or(wire::Reason::acknowledgement_unknown));
   return true;
 }
 

@@ -62,8 +62,9 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // `fate`: what the record says of it.
   wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                               const DatagramOwner& owner = {}, const wire::StepEntry& fate = {});
-  // Adds a back end, which later calls cleanup(). False if the queue has already stopped.
-  bool join();
+  // Adds a back end, which later calls cleanup(). False if the queue has already stopped, and for who must be
+  // `alone` also if its acknowledgement could be taken for another's.
+  bool join(bool alone);
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
   // tick at the latest.
   void cleanup();
@@ -83,7 +84,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   void readable();
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
-  // `events`: 1 for one that is to leave, without its bytes, which each transmission counts.
+  // `events`: 1 for the first transmission, 0 for further ones, of which each counts its bytes.
   bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
   MessageQueue::Recorder recorder() const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;

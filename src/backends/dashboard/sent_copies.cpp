@@ -11,13 +11,15 @@ void SentCopies::sent(std::uint64_t datagram, std::uint16_t eventNumber) {
   if (_copies.size() > _most) _copies.pop_front();
 }
 
-std::optional<std::uint64_t> SentCopies::answered(std::uint16_t eventNumber) {
+std::optional<SentCopies::Answered> SentCopies::answered(std::uint16_t eventNumber) {
   const auto copy = std::find_if(_copies.begin(), _copies.end(),
                                  [&](const Copy& one) { return one.eventNumber == eventNumber; });
   if (copy == _copies.end()) return std::nullopt;
   const std::uint64_t datagram = copy->datagram;
+  const bool certain =
+      std::all_of(_copies.begin(), _copies.end(), [&](const Copy& one) { return one.datagram == datagram; });
   _copies.erase(copy);
-  return datagram;
+  return Answered{datagram, certain};
 }
 
 void SentCopies::tick() {

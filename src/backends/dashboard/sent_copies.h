@@ -13,6 +13,7 @@ namespace veltrad::backends {
 // so the second answer to a datagram that was sent twice does not confirm another datagram. A copy that is
 // not answered within 9 ticks, the longest time between two transmissions, is considered lost. If copies were
 // lost, an answer may be matched to an earlier datagram; the later one is then sent once more than necessary.
+// Nobody can tell whose an answer is while copies of several datagrams are unanswered.
 class SentCopies {
  public:
   static constexpr std::uint64_t kTicks = 9;
@@ -20,10 +21,18 @@ class SentCopies {
   // `most`: how many copies are remembered; further ones replace the oldest.
   explicit SentCopies(std::size_t most) : _most(most) {}
 
+  struct Answered {
+    std::uint64_t datagram = 0;
+    // No other datagram has an unanswered copy.
+    bool certain = false;
+  };
+
   void sent(std::uint64_t datagram, std::uint16_t eventNumber);
   // Returns the datagram whose copy is answered, if any is unanswered.
-  std::optional<std::uint64_t> answered(std::uint16_t eventNumber);
+  std::optional<Answered> answered(std::uint16_t eventNumber);
   void tick();
+  // None is unanswered.
+  bool empty() const { return _copies.empty(); }
 
  private:
   struct Copy {

@@ -57,6 +57,19 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
   setDisplayURL(profile->displayURL);
 }
 
+// What is new in the filters reaches the events of the batch as ever: with the user info of the flush.
+void HTTPSPostBackend::takeOver(VeltraBackend& before) {
+  VeltraBackend::takeOver(before);
+  auto* other = dynamic_cast<HTTPSPostBackend*>(&before);
+  if (!other) return;
+  _held = other->_held;
+  _evictable = other->_evictable;
+  _writtenInfo = other->_writtenInfo;
+  _writtenFilters = other->_writtenFilters;
+  _lastLength = other->_lastLength;
+  _batchEdits = other->_batchEdits;
+}
+
 void HTTPSPostBackend::updateState() {
   setState(_clientState.updateBackendState());
 }

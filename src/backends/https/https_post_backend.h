@@ -42,6 +42,7 @@ class HTTPSPostBackend final : public VeltraBackend {
       const std::shared_ptr<const config::HTTPSPostProfile>& profile,
       const std::optional<std::string>& productFamily);
 
+  void takeOver(VeltraBackend& before) override;
   void updateState() override;
   Sent sendNumberedMessage(NumberedMessage&& message) override;
   std::optional<std::string> flushMessagesWithCompletion(FlushCompletion completion) override;
@@ -98,7 +99,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   // Of the events in the batch, and perhaps of some that were dropped from it.
   config::EditedFields _batchEdits;
 
-  const std::shared_ptr<HeldEvents> _held;
+  // Shared with the back end before, if this one has taken over from it. Constant once others know this one.
+  std::shared_ptr<HeldEvents> _held;
 };
 
 }  // namespace veltrad::backends

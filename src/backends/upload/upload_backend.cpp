@@ -75,8 +75,7 @@ UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name
 
 bool UploadBackend::uploadFileAtPath(const std::string& path, const std::string& extensionToken,
                                      const MessageNote& note) {
-  _fate = {};
-  _fate.message = note.number;
+  _fate = stepOf(note);
   logDebug("UploadBackend(uploadFileAtPath): Uploading file %s", path.c_str());
   if (prohibition()) {
     logError("UploadBackend(uploadFileAtPath): File %s stays: the owner of the device does not let it leave",

@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "wire/fates.h"
 #include "wire/names.h"
 
@@ -27,11 +28,6 @@ std::string formatError(const std::optional<wire::ReportingError>& error) {
   if (!error) return "null";
   return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", quoted(error->domain), error->code,
                      quoted(error->description));
-}
-
-std::string textIn(const Dictionary& outcome, const char* name) {
-  const std::string* text = outcome.string(name);
-  return text ? *text : std::string();
 }
 
 template <typename Use>

@@ -20,11 +20,6 @@ namespace {
 using config::PreferenceKey;
 using Use = PreferenceAccess::Use;
 
-int refused(const std::string& why, int status = 1) {
-  complain(why);
-  return status;
-}
-
 // Nothing: not set.
 std::optional<Value> setValue(const Dictionary& key) {
   const Value* value = key.find("value");

@@ -7,9 +7,9 @@
 #include <algorithm>
 #include <iterator>
 
-#include "base/text.h"
 #include "client/daemon_socket.h"
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/control_client.h"
 #include "tools/ctl/print.h"
 #include "wire/constants.h"
@@ -21,7 +21,7 @@ namespace veltrad::ctl {
 namespace {
 
 // Nine storebags, each of which may take 15 s.
-constexpr std::chrono::seconds kPatience{150};
+constexpr std::chrono::seconds kDoctorPatience{150};
 
 Value checkOf(const char* name, const char* result, std::string text, std::string mend = {}) {
   return Dictionary{{"name", name}, {"result", result}, {"text", std::move(text)}, {"mend", std::move(mend)}};
@@ -63,7 +63,8 @@ Array askForChecks(const Options& options) {
   if (!client) return withoutDaemon(client.error());
   Array types;
   for (const std::int32_t type : options.care.clientTypes) types.push_back(type);
-  auto answer = client.value().ask(wire::question::kDoctor, {{"clientTypes", std::move(types)}}, kPatience);
+  auto answer =
+      client.value().ask(wire::question::kDoctor, {{"clientTypes", std::move(types)}}, kDoctorPatience);
   if (!answer) {
     const bool mayNot = answer.error().find(wire::kObserveEntitlement) != std::string::npos;
     return mayNot ? withoutRight(options) : withoutDaemon(answer.error());
@@ -79,20 +80,15 @@ Array askForChecks(const Options& options) {
   return checks;
 }
 
-std::string textOf(const Dictionary& check, const char* key) {
-  const std::string* text = check.string(key);
-  return text ? escapedForLog(*text) : std::string();
-}
-
 std::string formatChecks(const Array& checks) {
   std::string all;
   for (const Value& value : checks) {
     const Dictionary* check = value.asDictionary();
     if (!check) continue;
     if (!all.empty()) all += '\n';
-    all += fmt::format("{:<8}{:<17}{}", textOf(*check, "result"), textOf(*check, "name"),
-                       textOf(*check, "text"));
-    if (const std::string mend = textOf(*check, "mend"); !mend.empty())
+    all += fmt::format("{:<8}{:<17}{}", textIn(*check, "result"), textIn(*check, "name"),
+                       textIn(*check, "text"));
+    if (const std::string mend = textIn(*check, "mend"); !mend.empty())
       all += fmt::format("\n{:8}to do: {}", "", mend);
   }
   return all;
@@ -104,7 +100,7 @@ int runDoctor(const Options& options) {
   Array checks = askForChecks(options);
   const bool failed = std::any_of(checks.begin(), checks.end(), [](const Value& value) {
     const Dictionary* check = value.asDictionary();
-    return check && textOf(*check, "result") == "failure";
+    return check && textIn(*check, "result") == "failure";
   });
   const bool printed =
       options.json ? printLine(formats::writeJSON(Dictionary{{"ok", !failed}, {"checks", std::move(checks)}}))

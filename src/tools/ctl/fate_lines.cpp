@@ -9,21 +9,17 @@ namespace veltrad::ctl {
 
 namespace {
 template <typename T>
-Value orNull(const std::optional<T>& value) {
+Value valueOrNull(const std::optional<T>& value) {
   return value ? Value(*value) : nullValue();
 }
 
 template <typename T>
-Value ifKnown(std::uint8_t known, std::uint8_t which, T value) {
+Value valueIfKnown(std::uint8_t known, std::uint8_t which, T value) {
   return (known & which) != 0 ? Value(value) : nullValue();
 }
 
 Value reasonOrNull(const std::optional<wire::Reason>& reason) {
   return reason ? Value(wire::entryOf(*reason).name) : nullValue();
-}
-
-std::optional<wire::Reason> reasonIn(std::uint8_t number) {
-  return number == wire::kNoReason ? std::nullopt : std::optional(static_cast<wire::Reason>(number));
 }
 
 template <typename Names>
@@ -56,10 +52,10 @@ Dictionary lineOfBackend(const support::BackendFate& fate, const std::vector<sup
                   {"hashed", arrayOf(fate.hashed)},
                   {"batch", numberOrNull(fate.batch)},
                   {"post", numberOrNull(fate.post)},
-                  {"url", orNull(fate.url)},
+                  {"url", valueOrNull(fate.url)},
                   {"bytes", numberOrNull(fate.bytes)},
                   {"events", numberOrNull(fate.events)},
-                  {"status", orNull(fate.status)},
+                  {"status", valueOrNull(fate.status)},
                   {"transmissions", fate.transmissions},
                   {"road", std::move(road)}};
   if (!fate.standing) {
@@ -73,7 +69,7 @@ Dictionary lineOfBackend(const support::BackendFate& fate, const std::vector<sup
   }
   const wire::StandingEntry& standing = *fate.standing;
   line.merge({{"state", int{standing.state}},
-              {"reason", reasonOrNull(reasonIn(standing.reason))},
+              {"reason", reasonOrNull(wire::reasonIn(standing.reason))},
               {"entry", standing.entry < 0 ? nullValue() : Value(standing.entry)},
               {"nearest", nearestOf(standing)},
               {"draw", standing.draw},
@@ -93,7 +89,7 @@ double secondsOf(std::int64_t time) {
 Dictionary lineOfStep(const support::ToldStep& step) {
   const wire::StepEntry& entry = step.entry;
   Dictionary line{{"time", secondsOf(entry.time)}, {"step", wire::nameOf(entry.step)}};
-  if (const auto reason = reasonIn(entry.reason)) line.set("reason", wire::entryOf(*reason).name);
+  if (const auto reason = wire::reasonIn(entry.reason)) line.set("reason", wire::entryOf(*reason).name);
   if (!step.names.empty()) line.set("fields", arrayOf(step.names));
   if (step.text) line.set(entry.step == wire::Step::aggregated ? "to" : "url", *step.text);
   if (entry.batch != 0) line.set("batch", entry.batch);
@@ -116,21 +112,21 @@ Dictionary lineOfMessage(const support::ToldMessage& message) {
       {"message", entry.message & ~wire::kNoMessage},
       {"time", secondsOf(entry.time)},
       {"from", kFrom[static_cast<std::size_t>(entry.from)]},
-      {"session", orNull(session.session)},
-      {"clientType", ifKnown(of.known, Session::clientTypeKnown, of.clientType)},
-      {"sessionID", ifKnown(of.known, Session::sessionIDKnown, of.sessionID)},
-      {"clientVersion", ifKnown(of.known, Session::clientVersionKnown, unsigned{of.clientVersion})},
-      {"client", orNull(session.client)},
-      {"service", orNull(session.service)},
-      {"category", ifKnown(entry.known, Message::categoryKnown, unsigned{entry.category})},
-      {"type", ifKnown(entry.known, Message::typeKnown, unsigned{entry.type})},
+      {"session", valueOrNull(session.session)},
+      {"clientType", valueIfKnown(of.known, Session::clientTypeKnown, of.clientType)},
+      {"sessionID", valueIfKnown(of.known, Session::sessionIDKnown, of.sessionID)},
+      {"clientVersion", valueIfKnown(of.known, Session::clientVersionKnown, unsigned{of.clientVersion})},
+      {"client", valueOrNull(session.client)},
+      {"service", valueOrNull(session.service)},
+      {"category", valueIfKnown(entry.known, Message::categoryKnown, unsigned{entry.category})},
+      {"type", valueIfKnown(entry.known, Message::typeKnown, unsigned{entry.type})},
       {"flag", entry.flag},
-      {"reason", reasonOrNull(reasonIn(entry.reason))},
+      {"reason", reasonOrNull(wire::reasonIn(entry.reason))},
       {"storebag", nullValue()}};
   if (session.storebag) {
     line.set("storebag", Dictionary{{"name", *session.storebag},
-                                    {"version", orNull(session.version)},
-                                    {"section", orNull(session.section)}});
+                                    {"version", valueOrNull(session.version)},
+                                    {"section", valueOrNull(session.section)}});
   }
   if (entry.item != Message::Item::message) line.set("kind", kItems[static_cast<std::size_t>(entry.item)]);
   return line;
@@ -142,7 +138,7 @@ Dictionary lineOfFates(const support::MessageFates& fates) {
   for (const auto& [name, fate] : fates.backends)
     backends.emplace_back(name, lineOfBackend(fate, fates.road));
   line.set("backends", Dictionary::fromEntries(std::move(backends)));
-  line.set("aggregatedTo", orNull(fates.aggregatedTo));
+  line.set("aggregatedTo", valueOrNull(fates.aggregatedTo));
   return line;
 }
 

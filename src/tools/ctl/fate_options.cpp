@@ -2,14 +2,10 @@
 // Which messages are asked for.
 #include "tools/ctl/fate_options.h"
 
-#include <fmt/format.h>
-
 #include <CLI/CLI.hpp>
-#include <charconv>
-#include <limits>
 
-#include "base/text.h"
 #include "tools/ctl/care_options.h"
+#include "tools/ctl/number_option.h"
 #include "wire/fates.h"
 
 namespace veltrad::ctl {
@@ -17,45 +13,20 @@ namespace {
 
 constexpr const char* kWhich = "Which messages";
 
-template <typename T>
-struct NumberOf {
-  using Type = T;
-};
-template <typename T>
-struct NumberOf<std::optional<T>> {
-  using Type = T;
-};
-
-template <typename T>
-void addNumber(CLI::App& command, const std::string& name, T& target, const std::string& help,
-               const char* group = kWhich) {
-  const auto read = [name, &target](const std::string& text) {
-    using Number = typename NumberOf<T>::Type;
-    Number number = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (error != std::errc() || end != text.data() + text.size()) {
-      throw CLI::ValidationError(name, fmt::format("expected an integer from {} to {}, found \"{}\"",
-                                                   std::numeric_limits<Number>::min(),
-                                                   std::numeric_limits<Number>::max(), escapedForLog(text)));
-    }
-    target = number;
-  };
-  command.add_option_function<std::string>(name, read, help)->type_name("N")->group(group);
-}
-
 std::string backendProblem(const std::string& text) {
   if (!text.empty()) return {};
   return "expected the name of a back end, such as httppost";
 }
 
 void addFilters(CLI::App& command, FateFilter& filter) {
-  addNumber(command, "--message", filter.message, "The message with this number");
-  addNumber(command, "--client-type", filter.clientType, "Of clients of this type");
-  addNumber(command, "--session-id", filter.sessionID, "Of sessions to which their clients gave this number");
-  addNumber(command, "--client-version", filter.clientVersion, "Of clients of this version");
-  addNumber(command, "--category", filter.category, "Of this category");
-  addNumber(command, "--type", filter.type, "Of this type");
-  addNumber(command, "--flag", filter.flag, "With this flag");
+  addNumber(command, "--message", filter.message, "The message with this number")->group(kWhich);
+  addNumber(command, "--client-type", filter.clientType, "Of clients of this type")->group(kWhich);
+  addNumber(command, "--session-id", filter.sessionID, "Of sessions to which their clients gave this number")
+      ->group(kWhich);
+  addNumber(command, "--client-version", filter.clientVersion, "Of clients of this version")->group(kWhich);
+  addNumber(command, "--category", filter.category, "Of this category")->group(kWhich);
+  addNumber(command, "--type", filter.type, "Of this type")->group(kWhich);
+  addNumber(command, "--flag", filter.flag, "With this flag")->group(kWhich);
   const auto addText = [&](const std::string& name, std::optional<std::string>& target,
                            const std::string& help) {
     return command.add_option(name, target, help)->type_name("NAME")->group(kWhich);
@@ -74,8 +45,7 @@ void addFates(CLI::App& app, Options& options) {
   CLI::App* why =
       addCommand(app, options, Command::why, "why", "Tell what became of messages, and why")->group(kCare);
   addFilters(*why, options.care.fates);
-  addNumber(*why, "--last", options.care.last, "At most so many, the newest that fit; 20 without it",
-            "Options");
+  addNumber(*why, "--last", options.care.last, "At most so many, the newest that fit; 20 without it");
   why->footer(
       "For each message: when, who, category and type, and for each back end its state and why, the whole\n"
       "road, and where the message is now. The daemon keeps a record of bounded size (\"fates\" in\n"
@@ -88,10 +58,17 @@ void addFates(CLI::App& app, Options& options) {
       addCommand(app, options, Command::watch, "watch", "Tell the same as it happens, until interrupted")
           ->group(kCare);
   addFilters(*watch, options.care.fates);
+  watch->add_flag("--contents", options.care.contents,
+                  "Also what the messages hold, which needs \"control\"");
   watch->footer(
       "One line for each message and each of its steps. What was overwritten before it could be read is "
       "counted\n"
-      "and said.\n\nExample:\n  veltractl watch --client lamp --json");
+      "and said. With --contents, payload and user info follow, without what policy.json removes and with "
+      "the\n"
+      "digests of what it hashes.\n\n"
+      "Examples:\n  veltractl watch --client lamp --json\n"
+      "  veltractl watch --json --contents >messages.jsonl   # for veltra-storebag explain and diff "
+      "--messages");
 }
 
 }  // namespace veltrad::ctl

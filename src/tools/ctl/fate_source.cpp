@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cstring>
 
+#include "tools/ctl/answer_fields.h"
 #include "wire/names.h"
 
 namespace veltrad::ctl {
@@ -12,9 +13,8 @@ namespace veltrad::ctl {
 namespace {
 constexpr std::size_t kEntryBytes = sizeof(std::uint64_t) + sizeof(wire::FateWords);
 
-std::uint64_t number(const Dictionary& answer, const char* key) {
-  const Value* value = answer.find(key);
-  return static_cast<std::uint64_t>(value ? value->toInt64().value_or(0) : 0);
+std::uint64_t positionIn(const Dictionary& answer, const char* key) {
+  return static_cast<std::uint64_t>(numberIn(answer, key));
 }
 }  // namespace
 
@@ -24,13 +24,13 @@ Result<Done, std::string> FateSource::readOn(bool patient) {
     if (!answer) return Failure{answer.error()};
     const std::uint64_t before = _next;
     if (auto done = read(answer.value()); !done) return done;
-    _waits = _next < number(answer.value(), "end");
+    _waits = _next < positionIn(answer.value(), "end");
     if (_next == before || !_waits) return Done();
   }
 }
 
 Result<Done, std::string> FateSource::read(const Dictionary& answer) {
-  if (number(answer, "layout") != wire::kFateLayout) {
+  if (positionIn(answer, "layout") != wire::kFateLayout) {
     return Failure{std::string(
         "veltrad keeps its record in another form than this veltractl reads: restart veltrad after its "
         "update.")};
@@ -38,10 +38,10 @@ Result<Done, std::string> FateSource::read(const Dictionary& answer) {
   const Value* entries = answer.find("entries");
   const Data* data = entries ? entries->asData() : nullptr;
   if (!data) return Failure{std::string("veltrad answered without entries.")};
-  const std::uint64_t refresh = number(answer, "refresh"), size = number(answer, "size");
-  const std::uint64_t end = number(answer, "end"), oldest = end > size ? end - size : 1;
+  const std::uint64_t refresh = positionIn(answer, "refresh"), size = positionIn(answer, "size");
+  const std::uint64_t end = positionIn(answer, "end"), oldest = end > size ? end - size : 1;
   if (!_reader) {
-    _messages = number(answer, "messages");
+    _messages = positionIn(answer, "messages");
     // A text is at most that much older than a session that names it, and the session than a message.
     _reader = std::make_unique<support::FateReader>(_listener, size);
   }
@@ -58,7 +58,7 @@ Result<Done, std::string> FateSource::read(const Dictionary& answer) {
     _expected = position + 1;
     _reader->read(position, words);
   }
-  _next = number(answer, "next");
+  _next = positionIn(answer, "next");
   return Done();
 }
 

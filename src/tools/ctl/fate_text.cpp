@@ -14,10 +14,6 @@ namespace veltrad::ctl {
 namespace {
 using wire::Step;
 
-std::optional<wire::Reason> reasonIn(std::uint8_t number) {
-  return number == wire::kNoReason ? std::nullopt : std::optional(static_cast<wire::Reason>(number));
-}
-
 std::string why(std::optional<wire::Reason> reason) {
   return reason ? ": " + std::string(wire::causeOf(*reason)) : std::string();
 }
@@ -35,7 +31,7 @@ std::string shown(const std::optional<std::string>& text) {
 
 std::string wordsOf(const support::ToldStep& step) {
   const wire::StepEntry& entry = step.entry;
-  const auto reason = reasonIn(entry.reason);
+  const auto reason = wire::reasonIn(entry.reason);
   switch (entry.step) {
     case Step::taken:
       return "taken in";
@@ -65,6 +61,8 @@ std::string wordsOf(const support::ToldStep& step) {
       return step.text ? "sent to " + shown(step.text) : "sent";
     case Step::again:
       return "sent again";
+    case Step::acknowledged:
+      return "acknowledged" + (reason == wire::Reason::acknowledged_by_number ? why(reason) : "");
     case Step::given_up:
       return "given up" + why(reason);
     case Step::dropped:
@@ -113,7 +111,7 @@ std::string standingOf(const wire::StandingEntry& standing) {
   static constexpr const char* kStates[] = {"waits", "does not report", "reports", "is held back"};
   std::string text = fmt::format("state {}, it {}", standing.state,
                                  standing.state < std::size(kStates) ? kStates[standing.state] : "?");
-  text += why(reasonIn(standing.reason));
+  text += why(wire::reasonIn(standing.reason));
   if (standing.entry >= 0) text += fmt::format("; client entry {}", standing.entry);
   if (standing.nearest >= 0) {
     const bool client = (standing.differs & wire::StandingEntry::clientDiffers) != 0;
@@ -177,7 +175,7 @@ std::string textOfStep(const support::ToldStep& step, std::string_view backend) 
 
 std::string textOfFates(const support::MessageFates& fates) {
   std::string text = textOfMessage(fates.message);
-  if (const auto reason = reasonIn(fates.message.entry.reason))
+  if (const auto reason = wire::reasonIn(fates.message.entry.reason))
     text += "\n  reached no back end" + why(reason);
   for (std::size_t i = 1; i < fates.road.size(); ++i) text += "\n  " + textOfStep(fates.road[i], {});
   for (const auto& [name, fate] : fates.backends) {

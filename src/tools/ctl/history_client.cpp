@@ -11,31 +11,31 @@ namespace veltrad::ctl {
 
 namespace {
 
-constexpr std::chrono::seconds kPatience{30};
+constexpr std::chrono::seconds kHistoryPatience{30};
 constexpr const char* kKeys[] = {"id",      "time",       "kind",      "to",      "bytes",
                                  "events",  "clientType", "sessionID", "client",  "service",
                                  "backend", "storebag",   "entry",     "removed", "hashed"};
 constexpr const char* kEndKeys[] = {"status", "error", "transmissions"};
 
-Value orNull(const Dictionary& from, const char* key) {
+Value fieldOrNull(const Dictionary& from, const char* key) {
   const Value* value = from.find(key);
   return value ? *value : Value(std::numeric_limits<double>::quiet_NaN());
 }
 
 HistoryItem itemOf(const Dictionary& record) {
   HistoryItem item;
-  for (const char* key : kKeys) item.facts.set(key, orNull(record, key));
-  for (const char* key : {"status", "error"}) item.facts.set(key, orNull({}, key));
+  for (const char* key : kKeys) item.facts.set(key, fieldOrNull(record, key));
+  for (const char* key : {"status", "error"}) item.facts.set(key, fieldOrNull({}, key));
   item.facts.set("transmissions", 1);
   const Array* headers = record.array("headers");
   if (headers) item.headers = *headers;
-  item.day = orNull(record, "day");
-  item.offset = orNull(record, "offset");
+  item.day = fieldOrNull(record, "day");
+  item.offset = fieldOrNull(record, "offset");
   const std::string* digest = record.string("sha256");
   if (digest) item.digest = *digest;
   if (!record.boolean("kept").value_or(true)) {
     item.facts.set("kept", false);
-    item.facts.set("sha256", orNull(record, "sha256"));
+    item.facts.set("sha256", fieldOrNull(record, "sha256"));
     if (!digest) item.digest = "unknown";
   }
   return item;
@@ -53,7 +53,7 @@ Result<std::vector<HistoryItem>, std::string> askForHistory(ControlClient& daemo
   std::map<std::string, std::size_t> places;
   Dictionary next;
   do {
-    auto page = daemon.ask(wire::question::kHistory, next, kPatience);
+    auto page = daemon.ask(wire::question::kHistory, next, kHistoryPatience);
     if (!page) return Failure{page.error()};
     const Array* records = page.value().array("records");
     for (const Value& one : records ? *records : Array()) {
@@ -64,7 +64,7 @@ Result<std::vector<HistoryItem>, std::string> askForHistory(ControlClient& daemo
         places[*id] = items.size();
         items.push_back(itemOf(*record));
       } else if (const auto begun = end ? places.find(*end) : places.end(); begun != places.end()) {
-        for (const char* key : kEndKeys) items[begun->second].facts.set(key, orNull(*record, key));
+        for (const char* key : kEndKeys) items[begun->second].facts.set(key, fieldOrNull(*record, key));
       }
     }
     const Dictionary* following = page.value().dictionary("next");
@@ -78,7 +78,7 @@ Result<std::string, std::string> askForBody(ControlClient& daemon, const History
   for (;;) {
     const auto answer =
         daemon.ask(wire::question::kHistoryBody,
-                   {{"day", item.day}, {"offset", item.offset}, {"from", body.size()}}, kPatience);
+                   {{"day", item.day}, {"offset", item.offset}, {"from", body.size()}}, kHistoryPatience);
     if (!answer) return Failure{answer.error()};
     const Value* bytes = answer.value().find("bytes");
     const Value* size = answer.value().find("size");

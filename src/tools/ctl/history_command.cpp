@@ -20,11 +20,6 @@ namespace veltrad::ctl {
 
 namespace {
 
-int refused(const std::string& why) {
-  complain(why);
-  return 1;
-}
-
 int list(ControlClient& daemon, const Options& options) {
   const auto items = askForHistory(daemon);
   if (!items) return refused(items.error());

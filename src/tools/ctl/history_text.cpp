@@ -14,14 +14,14 @@ namespace veltrad::ctl {
 
 namespace {
 
-std::optional<std::int64_t> number(const Dictionary& from, const char* key) {
+std::optional<std::int64_t> numberOrNone(const Dictionary& from, const char* key) {
   const Value* value = from.find(key);
   const auto real = value ? value->asReal() : nullptr;
   if (!value || (real && !std::isfinite(*real))) return std::nullopt;
   return value->toInt64();
 }
 
-std::string names(const HistoryItem& item, const char* key) {
+std::string nameList(const HistoryItem& item, const char* key) {
   std::string all;
   const Array* list = item.facts.array(key);
   for (const Value& name : list ? *list : Array())
@@ -44,15 +44,15 @@ std::string whatOf(const HistoryItem& item) {
   if (kind == "datagram") return "a datagram";
   if (kind == "file") return "a file";
   if (kind == "logData") return "log data";
-  const auto events = number(item.facts, "events").value_or(0);
+  const auto events = numberOrNone(item.facts, "events").value_or(0);
   return fmt::format("{} event{}", events, events == 1 ? "" : "s");
 }
 
 std::string outcomeOf(const HistoryItem& item) {
-  const auto transmissions = number(item.facts, "transmissions").value_or(1);
+  const auto transmissions = numberOrNone(item.facts, "transmissions").value_or(1);
   std::string text = transmissions > 1 ? fmt::format("sent {} times", transmissions) : "";
   const auto add = [&text](const std::string& more) { text += (text.empty() ? "" : ", ") + more; };
-  if (const auto status = number(item.facts, "status")) add(fmt::format("HTTP {}", *status));
+  if (const auto status = numberOrNone(item.facts, "status")) add(fmt::format("HTTP {}", *status));
   if (const std::string error = item.text("error"); !error.empty()) add(escapedForLog(error));
   if (text.empty()) return item.text("kind") == "datagram" ? "sent" : "the outcome is not known";
   return text;
@@ -61,14 +61,14 @@ std::string outcomeOf(const HistoryItem& item) {
 std::string whoseOf(const HistoryItem& item) {
   const std::string client = item.text("client"), service = item.text("service");
   if (!client.empty()) return escapedForLog(service.empty() ? client : client + "/" + service);
-  const auto type = number(item.facts, "clientType");
+  const auto type = numberOrNone(item.facts, "clientType");
   return type ? fmt::format("client type {}", *type) : "an unknown client";
 }
 
 std::string lineOfItem(const HistoryItem& item) {
   return fmt::format("{}  {}  {} to {} ({} bytes) of {}: {}", item.text("id"), timeText(item.time()),
-                     whatOf(item), escapedForLog(item.text("to")), number(item.facts, "bytes").value_or(0),
-                     whoseOf(item), outcomeOf(item));
+                     whatOf(item), escapedForLog(item.text("to")),
+                     numberOrNone(item.facts, "bytes").value_or(0), whoseOf(item), outcomeOf(item));
 }
 
 std::vector<std::pair<std::string, std::string>> detailsOf(const HistoryItem& item) {
@@ -77,18 +77,18 @@ std::vector<std::pair<std::string, std::string>> detailsOf(const HistoryItem& it
     if (!text.empty()) details.emplace_back(name, std::move(text));
   };
   add("back end", escapedForLog(item.text("backend")));
-  if (const auto id = number(item.facts, "sessionID")) add("session", fmt::format("{}", *id));
+  if (const auto id = numberOrNone(item.facts, "sessionID")) add("session", fmt::format("{}", *id));
   if (const Dictionary* storebag = item.facts.dictionary("storebag")) {
     std::string let;
     for (const char* key : {"name", "version", "section"}) {
       const std::string* part = storebag->string(key);
       if (part) let += (let.empty() ? "" : ", ") + std::string(key) + " " + escapedForLog(*part);
     }
-    if (const auto entry = number(item.facts, "entry")) let += fmt::format(", client entry {}", *entry);
+    if (const auto entry = numberOrNone(item.facts, "entry")) let += fmt::format(", client entry {}", *entry);
     add("storebag", std::move(let));
   }
-  add("removed", names(item, "removed"));
-  add("hashed", names(item, "hashed"));
+  add("removed", nameList(item, "removed"));
+  add("hashed", nameList(item, "hashed"));
   return details;
 }
 
@@ -104,7 +104,7 @@ std::string headOfItem(const HistoryItem& item) {
 
 std::string withoutBody(const HistoryItem& item) {
   return fmt::format("The body was too large to be kept: {} bytes, SHA-256 {}",
-                     number(item.facts, "bytes").value_or(0), item.digest.value_or("unknown"));
+                     numberOrNone(item.facts, "bytes").value_or(0), item.digest.value_or("unknown"));
 }
 
 }  // namespace veltrad::ctl

@@ -5,14 +5,13 @@
 #include <fmt/format.h>
 
 #include <CLI/CLI.hpp>
-#include <charconv>
-#include <limits>
 #include <sstream>
 #include <vector>
 
 #include "base/text.h"
 #include "config/preference_keys.h"
 #include "tools/ctl/care_options.h"
+#include "tools/ctl/number_option.h"
 #include "tools/ctl/owner_options.h"
 #include "tools/key_value.h"
 #include "veltra/veltra.h"
@@ -47,22 +46,6 @@ std::string flagProblem(const std::string& text) {
   return fmt::format("expected an integer from 0 to 3, found \"{}\"", escapedForLog(text));
 }
 
-// A decimal number in the range of T.
-template <typename T, typename Target>
-CLI::Option* addNumber(CLI::App& app, const std::string& name, Target& target, const std::string& help) {
-  const auto read = [name, &target](const std::string& text) {
-    T number = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
-    if (error != std::errc() || end != text.data() + text.size()) {
-      throw CLI::ValidationError(
-          name, fmt::format("expected an integer from {} to {}, found \"{}\"", std::numeric_limits<T>::min(),
-                            std::numeric_limits<T>::max(), escapedForLog(text)));
-    }
-    target = number;
-  };
-  return app.add_option_function<std::string>(name, read, help)->type_name("N");
-}
-
 void addText(CLI::App& app, const std::string& name, std::optional<std::string>& target,
              const std::string& help) {
   app.add_option(name, target, help)
@@ -74,13 +57,11 @@ void addText(CLI::App& app, const std::string& name, std::optional<std::string>&
 // `oneEach`: the option takes one value, because further arguments belong to the command.
 void addIdentity(CLI::App& app, Identity& identity, Texts& texts, bool oneEach) {
   const char* group = "Identity";
-  addNumber<std::int32_t>(app, "--client-type", identity.clientType,
-                          "Kind of client, which selects the storebag; 0 to 17 are defined")
+  addNumber(app, "--client-type", identity.clientType,
+            "Kind of client, which selects the storebag; 0 to 17 are defined")
       ->group(group);
-  addNumber<std::uint32_t>(app, "--session-id", identity.sessionID, "The client's number for this session")
-      ->group(group);
-  addNumber<std::uint16_t>(app, "--client-version", identity.clientVersion,
-                           "The client's version, 0 to 65535")
+  addNumber(app, "--session-id", identity.sessionID, "The client's number for this session")->group(group);
+  addNumber(app, "--client-version", identity.clientVersion, "The client's version, 0 to 65535")
       ->group(group);
   addText(app, "--client", texts.client, "User info \"clientName\"");
   addText(app, "--service", texts.service, "User info \"serviceName\"");
@@ -144,10 +125,8 @@ void addSession(CLI::App& app, Options& options, Texts& texts) {
 }
 
 void addMessage(CLI::App& app, Options& options, Texts& texts) {
-  addNumber<std::uint16_t>(app, "--category", options.category, "What the message is about, 0 to 65535")
-      ->required();
-  addNumber<std::uint16_t>(app, "--type", options.type, "Which message of the category, 0 to 65535")
-      ->required();
+  addNumber(app, "--category", options.category, "What the message is about, 0 to 65535")->required();
+  addNumber(app, "--type", options.type, "Which message of the category, 0 to 65535")->required();
   app.add_option("payload", texts.payload,
                  "Entries of the payload. 12, -0.5 and 1e3 become numbers, true and\n"
                  "false become booleans, everything else becomes a text")
@@ -160,8 +139,7 @@ void addSend(CLI::App& app, Options& options, Texts& texts) {
   CLI::App* send =
       addCommand(app, options, Command::send, "send", "Send one message in a session of its own");
   addMessage(*send, options, texts);
-  addNumber<std::uint32_t>(*send, "--flag", options.flag,
-                           "1: post at once, 2: regardless of sampling, 3: both, 0: neither")
+  addNumber(*send, "--flag", options.flag, "1: post at once, 2: regardless of sampling, 3: both, 0: neither")
       ->check(CLI::Validator(flagProblem, ""));
   send->add_option_function<std::string>(
           "--expect", [&options](const std::string&) { options.expectReported = true; },

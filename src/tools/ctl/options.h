@@ -75,6 +75,8 @@ struct Care {
   // why, watch.
   FateFilter fates;
   std::size_t last = 20;
+  // watch: also what the messages hold.
+  bool contents = false;
 };
 
 // Its 13 fields are the command's options and arguments, by name.

@@ -30,4 +30,9 @@ void complain(std::string_view text) {
   std::fflush(stderr);
 }
 
+int refused(std::string_view why, int status) {
+  complain(why);
+  return status;
+}
+
 }  // namespace veltrad::ctl

@@ -12,5 +12,7 @@ namespace veltrad::ctl {
 void remark(std::string_view line);
 // Prints "veltractl: …" on standard error.
 void complain(std::string_view text);
+// Complains; gives the status with which to exit.
+int refused(std::string_view why, int status = 1);
 
 }  // namespace veltrad::ctl

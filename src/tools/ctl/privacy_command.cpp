@@ -8,6 +8,7 @@
 
 #include "base/text.h"
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/control_client.h"
 #include "tools/ctl/history_text.h"
 #include "tools/ctl/print.h"
@@ -19,25 +20,9 @@ namespace {
 
 namespace question = wire::question;
 
-std::int64_t number(const Dictionary& from, const char* key) {
-  const Value* value = from.find(key);
-  return value ? value->toInt64().value_or(0) : 0;
-}
-
-std::string text(const Dictionary& from, const char* key) {
-  const std::string* value = from.string(key);
-  return value ? escapedForLog(*value) : std::string();
-}
-
 const Dictionary& dictionary(const Dictionary& from, const char* key) {
   static const Dictionary kNone;
   const Dictionary* value = from.dictionary(key);
-  return value ? *value : kNone;
-}
-
-const Array& array(const Dictionary& from, const char* key) {
-  static const Array kNone;
-  const Array* value = from.array(key);
   return value ? *value : kNone;
 }
 
@@ -45,7 +30,7 @@ const Array& array(const Dictionary& from, const char* key) {
 std::string amounts(const Dictionary& of, std::initializer_list<const char*> keys) {
   std::string all;
   for (const char* key : keys) {
-    const auto count = number(of, key);
+    const auto count = numberIn(of, key);
     if (count == 0) continue;
     std::string name = std::string_view(key) == "logData" ? "log data" : key;
     if (count == 1 && name.ends_with('s')) name.pop_back();
@@ -54,17 +39,17 @@ std::string amounts(const Dictionary& of, std::initializer_list<const char*> key
   return all;
 }
 
-std::string orNothing(std::string text) {
+std::string orNothing(const std::string& text) {
   return text.empty() ? "nothing" : text;
 }
 
 std::string formatIdentifiers(const Dictionary& answer) {
   std::string out = "identifiers";
-  for (const Value& one : array(answer, "identifiers")) {
+  for (const Value& one : arrayIn(answer, "identifiers")) {
     const Dictionary* identifier = one.asDictionary();
     if (!identifier) continue;
     const auto made = identifier->real("made");
-    out += fmt::format("\n  {:<16} {}{}{}", text(*identifier, "name"), text(*identifier, "value"),
+    out += fmt::format("\n  {:<16} {}{}{}", textIn(*identifier, "name"), textIn(*identifier, "value"),
                        made && std::isfinite(*made) ? "  made " + timeText(*made) : "",
                        identifier->boolean("resettable").value_or(true) ? "" : "  given in device.plist");
   }
@@ -76,43 +61,42 @@ std::string formatPrivacy(const Dictionary& answer) {
   const Dictionary* policy = answer.dictionary("policy");
   const bool asked = consent && consent->isBoolean();
   std::string out = fmt::format(
-      "reporting  {}\nconsent    {}\npolicy     {}\n{}\nleft in the last day", text(answer, "reporting"),
+      "reporting  {}\nconsent    {}\npolicy     {}\n{}\nleft in the last day", textIn(answer, "reporting"),
       !asked                  ? "never given"
       : *consent->toBoolean() ? "given"
                               : "refused",
-      policy ? escapedForLog(formats::writeJSON(*policy)) : orNothing(text(answer, "policy")),
+      policy ? escapedForLog(formats::writeJSON(*policy)) : orNothing(textIn(answer, "policy")),
       formatIdentifiers(answer));
-  for (const Value& one : array(answer, "destinations")) {
+  for (const Value& one : arrayIn(answer, "destinations")) {
     const Dictionary* destination = one.asDictionary();
     if (!destination) continue;
-    out += fmt::format("\n  to {}: {}, {} bytes", text(*destination, "to"),
+    out += fmt::format("\n  to {}: {}, {} bytes", textIn(*destination, "to"),
                        orNothing(amounts(*destination, {"events", "datagrams", "files", "logData"})),
-                       number(*destination, "bytes"));
+                       numberIn(*destination, "bytes"));
   }
-  return array(answer, "destinations").empty() ? out + "\n  nothing" : out;
+  return arrayIn(answer, "destinations").empty() ? out + "\n  nothing" : out;
 }
 
 std::string formatReceipt(const Dictionary& answer) {
   const Dictionary& dropped = dictionary(answer, "dropped");
   std::string out = "Reporting is off.\ndropped    " +
                     orNothing(amounts(dropped, {"events", "datagrams", "files", "posts"}));
-  for (const Value& one : array(dropped, "byClient")) {
+  for (const Value& one : arrayIn(dropped, "byClient")) {
     const Dictionary* client = one.asDictionary();
     if (!client) continue;
-    const std::string name = text(*client, "client"), service = text(*client, "service");
-    out += fmt::format("\n  of {}, session {}: {}",
-                       name.empty()      ? fmt::format("client type {}", number(*client, "clientType"))
-                       : service.empty() ? name
-                                         : name + "/" + service,
-                       number(*client, "sessionID"), amounts(*client, {"events", "datagrams", "files"}));
+    const std::string name = textIn(*client, "client"), service = textIn(*client, "service");
+    const std::string who = name.empty() ? fmt::format("client type {}", numberIn(*client, "clientType"))
+                                         : fmt::format("{}{}{}", name, service.empty() ? "" : "/", service);
+    out += fmt::format("\n  of {}, session {}: {}", who, numberIn(*client, "sessionID"),
+                       amounts(*client, {"events", "datagrams", "files"}));
   }
   const std::string begun = amounts(dictionary(answer, "underWay"), {"posts", "events", "files"});
   const Dictionary& disk = dictionary(answer, "onDisk");
   return out + fmt::format(
                    "\nunder way  {}\n"
                    "on disk    message log {}, energy log {}, history {} bytes",
-                   begun.empty() ? "nothing" : begun + ": ended within a second", number(disk, "messageLog"),
-                   number(disk, "energyLog"), number(disk, "history"));
+                   begun.empty() ? "nothing" : begun + ": ended within a second",
+                   numberIn(disk, "messageLog"), numberIn(disk, "energyLog"), numberIn(disk, "history"));
 }
 
 std::string wordsOf(Command command, const Dictionary& answer) {
@@ -120,7 +104,7 @@ std::string wordsOf(Command command, const Dictionary& answer) {
     case Command::privacyOff:
       return formatReceipt(answer);
     case Command::privacyOn:
-      return text(answer, "reporting") == "on"
+      return textIn(answer, "reporting") == "on"
                  ? "Reporting is on."
                  : "Reporting stays off: etc/veltrad/policy.json says so, or it is broken.";
     case Command::privacyReset:
@@ -155,7 +139,7 @@ int runPrivacy(const Options& options) {
   }
   const bool printed =
       printLine(options.json ? formats::writeJSON(answer.value()) : wordsOf(options.command, answer.value()));
-  const bool staysOff = options.command == Command::privacyOn && text(answer.value(), "reporting") != "on";
+  const bool staysOff = options.command == Command::privacyOn && textIn(answer.value(), "reporting") != "on";
   return printed && !staysOff ? 0 : 1;
 }
 

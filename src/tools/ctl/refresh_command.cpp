@@ -7,8 +7,8 @@
 #include <string>
 #include <vector>
 
-#include "base/text.h"
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/control_client.h"
 #include "tools/ctl/print.h"
 #include "wire/names.h"
@@ -18,7 +18,7 @@ namespace veltrad::ctl {
 namespace {
 
 // The daemon gives a server 15 s, and may wait for another's fetch of the same name first.
-constexpr std::chrono::seconds kPatience{60};
+constexpr std::chrono::seconds kRefreshPatience{60};
 
 // Those with a record, else all.
 Result<std::vector<std::string>, std::string> namesToRefresh(ControlClient& daemon) {
@@ -37,15 +37,10 @@ Result<std::vector<std::string>, std::string> namesToRefresh(ControlClient& daem
   return asked.empty() ? all : asked;
 }
 
-std::string textOf(const Dictionary& from, const char* key) {
-  const std::string* text = from.string(key);
-  return text ? escapedForLog(*text) : std::string();
-}
-
 std::string lineOf(const Dictionary& storebag, bool fetched) {
-  std::string line = fmt::format("{}: {}", textOf(storebag, "name"), textOf(storebag, "result"));
-  const std::string signature = textOf(storebag, "signature"), reason = textOf(storebag, "reason");
-  const std::string version = textOf(storebag, "version");
+  std::string line = fmt::format("{}: {}", textIn(storebag, "name"), textIn(storebag, "result"));
+  const std::string signature = textIn(storebag, "signature"), reason = textIn(storebag, "reason");
+  const std::string version = textIn(storebag, "version");
   if (!signature.empty()) line += ", signature " + signature;
   if (!reason.empty()) line += ": " + reason;
   if (!version.empty()) line += fetched ? ", version " + version : "; version " + version + " stays in use";
@@ -66,12 +61,12 @@ int runRefresh(const Options& options) {
   Array storebags;
   bool all = true;
   for (const std::string& name : names.value()) {
-    auto answer = daemon.value().ask(wire::question::kRefresh, {{"name", name}}, kPatience);
+    auto answer = daemon.value().ask(wire::question::kRefresh, {{"name", name}}, kRefreshPatience);
     if (!answer) {
       complain(answer.error());
       return 1;
     }
-    const bool fetched = textOf(answer.value(), "result") == "fetched";
+    const bool fetched = textIn(answer.value(), "result") == "fetched";
     all = all && fetched;
     if (!options.json && !printLine(lineOf(answer.value(), fetched))) return 1;
     storebags.push_back(std::move(answer.value()));

@@ -10,7 +10,7 @@
 #include <set>
 #include <vector>
 
-#include "base/text.h"
+#include "tools/ctl/answer_fields.h"
 
 namespace veltrad::ctl {
 
@@ -18,26 +18,10 @@ namespace {
 
 using Listed = std::map<std::int64_t, std::vector<std::int64_t>>;
 
-std::int64_t number(const Dictionary& from, const char* key) {
-  const Value* value = from.find(key);
-  return value ? value->toInt64().value_or(0) : 0;
-}
-
 // Absent: null.
 std::optional<double> real(const Dictionary& from, const char* key) {
   const auto value = from.real(key);
   return value && std::isfinite(*value) ? value : std::nullopt;
-}
-
-std::string text(const Dictionary& from, const char* key, const char* otherwise) {
-  const std::string* value = from.string(key);
-  return escapedForLog(value ? *value : otherwise);
-}
-
-const Array& array(const Dictionary& from, const char* key) {
-  static const Array kNone;
-  const Array* value = from.array(key);
-  return value ? *value : kNone;
 }
 
 Value sessionWithChildren(std::int64_t id, std::map<std::int64_t, Dictionary>& sessions,
@@ -61,39 +45,41 @@ const char* stateName(std::int64_t state) {
 
 void addSession(std::string& out, const Dictionary& session, const std::string& indent) {
   const auto clientType = real(session, "clientType");
-  out += fmt::format(
-      "\n{}{} {}: {}, client type {}", indent, "session", number(session, "sessionID"),
-      text(session, "clientName", "no client name") + " / " + text(session, "serviceName", "no service name"),
-      clientType ? fmt::format("{}", *clientType) : "unknown");
-  for (const Value& one : array(session, "backends")) {
+  out += fmt::format("\n{}{} {}: {}, client type {}", indent, "session", numberIn(session, "sessionID"),
+                     textIn(session, "clientName", "no client name") + " / " +
+                         textIn(session, "serviceName", "no service name"),
+                     clientType ? fmt::format("{}", *clientType) : "unknown");
+  for (const Value& one : arrayIn(session, "backends")) {
     const Dictionary* backend = one.asDictionary();
     if (!backend) continue;
     const Dictionary* reason = backend->dictionary("reason");
-    out += fmt::format(
-        "\n{}  {:<13} {} ({} held, {} under way, last: {})", indent, text(*backend, "name", ""),
-        reason ? text(*reason, "text", "") : stateName(number(*backend, "state")), number(*backend, "held"),
-        number(*backend, "underWay"), text(*backend, "lastOutcome", "nothing yet"));
+    out +=
+        fmt::format("\n{}  {:<13} {} ({} held, {} under way, last: {})", indent, textIn(*backend, "name", ""),
+                    reason ? textIn(*reason, "text", "") : stateName(numberIn(*backend, "state")),
+                    numberIn(*backend, "held"), numberIn(*backend, "underWay"),
+                    textIn(*backend, "lastOutcome", "nothing yet"));
   }
-  for (const Value& child : array(session, "children")) {
+  for (const Value& child : arrayIn(session, "children")) {
     if (const Dictionary* dictionary = child.asDictionary()) addSession(out, *dictionary, indent + "    ");
   }
 }
 
 void addDaemon(std::string& out, const Dictionary& daemon) {
   const Dictionary* memory = daemon.dictionary("memory");
-  out += fmt::format("veltrad {}, process {}, up {}, {:.1f} MiB resident", text(daemon, "version", "?"),
-                     number(daemon, "pid"), formatDuration(real(daemon, "uptime").value_or(0)),
-                     memory ? static_cast<double>(number(*memory, "resident")) / (1 << 20) : 0.0);
-  for (const Value& one : array(daemon, "limits")) {
+  out += fmt::format("veltrad {}, process {}, up {}, {:.1f} MiB resident", textIn(daemon, "version", "?"),
+                     numberIn(daemon, "pid"), formatDuration(real(daemon, "uptime").value_or(0)),
+                     memory ? static_cast<double>(numberIn(*memory, "resident")) / (1 << 20) : 0.0);
+  for (const Value& one : arrayIn(daemon, "limits")) {
     const Dictionary* limit = one.asDictionary();
     if (!limit) continue;
-    const double used = static_cast<double>(number(*limit, "used"));
-    const double most = static_cast<double>(number(*limit, "limit"));
-    const std::string name = text(*limit, "name", "");
+    const double used = static_cast<double>(numberIn(*limit, "used"));
+    const double most = static_cast<double>(numberIn(*limit, "limit"));
+    const std::string name = textIn(*limit, "name", "");
     const double unit = name == "memory" ? 1 << 20 : 1;
     out += fmt::format("\n  {:<13} {:.0f} of {:.0f}{} ({:.0f} %)", name, used / unit, most / unit,
                        unit > 1 ? " MiB" : "", most > 0 ? 100 * used / most : 0);
   }
+  if (daemon.string("clock")) out += "\n  the clock is " + textIn(daemon, "clock", "");
 }
 
 void addStorebags(std::string& out, const Array& storebags, double now) {
@@ -109,10 +95,12 @@ void addStorebags(std::string& out, const Array& storebags, double now) {
     }
     const double wait = real(*storebag, "nextAttempt").value_or(now) - now;
     out += fmt::format(
-        "\n  {:<13} version {}, {} {} ago, next attempt {}", text(*storebag, "name", ""),
-        text(*storebag, "version", "unknown"),
-        text(*storebag, "state", "") == "successful" ? "fetched" : "fetch failed", formatDuration(*age),
+        "\n  {:<13} version {}, {} {} ago, next attempt {}", textIn(*storebag, "name", ""),
+        textIn(*storebag, "version", "unknown"),
+        textIn(*storebag, "state", "") == "successful" ? "fetched" : "fetch failed", formatDuration(*age),
         wait > 0 ? "not before " + formatDuration(wait) + " from now" : "with the next session");
+    if (storebag->string("refusal"))
+      out += "\n    the last one was refused: " + textIn(*storebag, "refusal", "");
   }
   if (never > 0) out += fmt::format("\n  {} others: no session has asked for them", never);
 }
@@ -124,8 +112,8 @@ void addServers(std::string& out, const Array& servers, double now) {
     const Dictionary* server = one.asDictionary();
     if (!server) continue;
     const auto last = real(*server, "lastSuccess");
-    out += fmt::format("\n  {}: last success {}, {} failures since", text(*server, "address", ""),
-                       last ? formatDuration(now - *last) + " ago" : "never", number(*server, "failures"));
+    out += fmt::format("\n  {}: last success {}, {} failures since", textIn(*server, "address", ""),
+                       last ? formatDuration(now - *last) + " ago" : "never", numberIn(*server, "failures"));
   }
 }
 
@@ -135,13 +123,13 @@ Array treeOfSessions(Array listed) {
   std::map<std::int64_t, Dictionary> sessions;
   for (Value& one : listed) {
     if (auto session = std::move(one).takeDictionary()) {
-      const std::int64_t id = number(*session, "id");
+      const std::int64_t id = numberIn(*session, "id");
       sessions.emplace(id, std::move(*session));
     }
   }
   Listed below;  // 0: of no parent
   for (const auto& [id, session] : sessions) {
-    const std::int64_t parent = number(session, "parent");
+    const std::int64_t parent = numberIn(session, "parent");
     below[sessions.contains(parent) ? parent : 0].push_back(id);
   }
   Array tree;
@@ -161,13 +149,13 @@ std::string formatDuration(double seconds) {
 std::string formatStatus(const Dictionary& status, double now) {
   std::string out;
   if (const Dictionary* daemon = status.dictionary("daemon")) addDaemon(out, *daemon);
-  const Array& sessions = array(status, "sessions");
+  const Array& sessions = arrayIn(status, "sessions");
   out += sessions.empty() ? "\n\nNo session is open." : "\n\nSessions";
   for (const Value& session : sessions) {
     if (const Dictionary* dictionary = session.asDictionary()) addSession(out, *dictionary, "  ");
   }
-  addStorebags(out, array(status, "storebags"), now);
-  addServers(out, array(status, "servers"), now);
+  addStorebags(out, arrayIn(status, "storebags"), now);
+  addServers(out, arrayIn(status, "servers"), now);
   return out;
 }
 

@@ -6,6 +6,7 @@
 #include <unordered_set>
 
 #include "formats/json.h"
+#include "tools/ctl/contents_source.h"
 #include "tools/ctl/fate_lines.h"
 #include "tools/ctl/fate_source.h"
 #include "tools/ctl/fate_text.h"
@@ -21,10 +22,13 @@ constexpr std::chrono::milliseconds kLookAgain{100};
 // Prints what fits, from begin() on.
 class Watcher final : public support::FateReader::Listener {
  public:
-  explicit Watcher(const Options& options) : _options(options) {}
+  // `contents` is null if they are not asked for.
+  Watcher(const Options& options, ContentsSource* contents) : _options(options), _contents(contents) {}
 
   void begin() { _printing = true; }
   bool failed() const { return _failed; }
+  // Of messages that were told.
+  std::uint64_t lostContents() const { return _lostContents; }
 
   void taken(const support::ToldMessage& message) override {
     if (!message.session || !fits(_options.care.fates, message)) return;
@@ -34,7 +38,10 @@ class Watcher final : public support::FateReader::Listener {
     if (!_printing) return;
     Dictionary line = lineOfMessage(message);
     line.set("event", "message");
-    print(line, textOfMessage(message));
+    std::string text = textOfMessage(message);
+    const bool isMessage = message.entry.item == wire::MessageEntry::Item::message;
+    if (_contents && isMessage) addContents(message.entry.message, line, text);
+    print(line, text);
   }
 
   void stepped(const support::ToldStep& step) override {
@@ -51,19 +58,46 @@ class Watcher final : public support::FateReader::Listener {
     print(line, textOfStep(step, fmt::format("{}{}{}", message, backend.empty() ? "" : " ", backend)));
   }
 
-  void lost(std::uint64_t entries) {
-    print({{"event", "lost"}, {"entries", entries}},
-          fmt::format("{} entries were overwritten before they could be read", entries));
+  void lost(std::uint64_t entries, std::uint64_t contents) {
+    Dictionary line{{"event", "lost"}, {"entries", entries}};
+    std::string text = fmt::format("{} entries were overwritten before they could be read", entries);
+    if (_contents) {
+      line.set("contents", contents);
+      text += fmt::format(", and the contents of {} messages", contents);
+    }
+    print(line, text);
   }
 
  private:
   static constexpr std::size_t kMostTold = 1u << 20;
+
+  void addContents(std::uint64_t message, Dictionary& line, std::string& text) {
+    const auto found = _contents->of(message);
+    if (!found) {
+      complain(found.error());
+      _failed = true;
+      return;
+    }
+    const auto& contents = found.value();
+    if (!contents) {
+      ++_lostContents;
+      line.set("contentsLost", true);
+      text += "\n  its contents are lost";
+    }
+    for (const char* key : {"payload", "userInfo"}) {
+      const Dictionary* held = contents ? contents->dictionary(key) : nullptr;
+      line.set(key, held ? Value(*held) : nullValue());
+      if (held) text += fmt::format("\n  {} {}", key, formats::writeJSON(*held));
+    }
+  }
 
   void print(const Dictionary& line, const std::string& text) {
     if (!_failed) _failed = !printLine(_options.json ? formats::writeJSON(line) : text);
   }
 
   const Options& _options;
+  ContentsSource* const _contents;
+  std::uint64_t _lostContents = 0;
   bool _printing = false;
   bool _failed = false;
   std::unordered_set<std::uint64_t> _told;
@@ -77,17 +111,27 @@ int runWatch(const Options& options, Interrupt& interrupt) {
     complain(daemon.error());
     return 1;
   }
-  Watcher watcher(options);
+  ContentsSource contents(daemon.value());
+  Watcher watcher(options, options.care.contents ? &contents : nullptr);
   FateSource source(daemon.value(), watcher);
+  const auto readOn = [&](bool patient) {
+    auto done = source.readOn(patient);
+    // Also those that nobody asks for, so that others are not lost behind them.
+    return done && options.care.contents ? contents.readOn() : std::move(done);
+  };
   interrupt.begin();
+  // From now on the daemon keeps contents, so that it has those of all messages that are told.
+  Result<Done, std::string> done = options.care.contents ? contents.readOn() : Done();
   // What was written before says what later entries mean.
-  auto done = source.readOn(true);
-  std::uint64_t missing = source.missing();
+  if (done) done = readOn(true);
+  std::uint64_t missing = source.missing(), lost = 0;
   watcher.begin();
   while (done && !watcher.failed() && interrupt.wait(-1, kLookAgain) != Interrupt::Wake::interrupted) {
-    done = source.readOn(!source.waits());
-    if (source.missing() > missing) watcher.lost(source.missing() - missing);
+    done = readOn(!source.waits());
+    if (source.missing() > missing || watcher.lostContents() > lost)
+      watcher.lost(source.missing() - missing, watcher.lostContents() - lost);
     missing = source.missing();
+    lost = watcher.lostContents();
   }
   if (!done) complain(done.error());
   return done && !watcher.failed() ? 0 : 1;

@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 
+#include <cmath>
 #include <limits>
 
 #include "gateway/clean_json.h"
@@ -53,9 +54,8 @@ std::optional<std::int32_t> integerField(const Dictionary& event, std::string_vi
   const Value* value = event.find(key);
   if (!value || !value->isNumber()) return std::nullopt;
   const std::optional<double> number = value->toDouble();
-  if (!number || *number != static_cast<double>(static_cast<std::int64_t>(*number))) return std::nullopt;
-  if (*number < std::numeric_limits<std::int32_t>::min() ||
-      *number > std::numeric_limits<std::int32_t>::max())
+  if (!number || *number < std::numeric_limits<std::int32_t>::min() ||
+      *number > std::numeric_limits<std::int32_t>::max() || *number != std::trunc(*number))
     return std::nullopt;
   return static_cast<std::int32_t>(*number);
 }

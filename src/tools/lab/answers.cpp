@@ -19,13 +19,19 @@ std::optional<std::int64_t> fromHTTPDate(const std::string& text) {
   return ::timegm(&parts);
 }
 
-std::string bodyFor(const Dictionary& storebag, const config::SigningKey& key, Rule::Signature sign) {
-  if (sign == Rule::Signature::right) return config::makeStorebagContainer(key, storebag);
-  std::string bag = formats::writeXMLPropertyList(storebag);
+Result<std::string, std::string> bodyFor(const StorebagFile& file, const Directory& directory,
+                                         const std::optional<Rule>& rule) {
+  const auto sign = rule ? rule->sign : Rule::Signature::right;
+  if (!file.container.empty()) return file.container;
+  if (sign == Rule::Signature::right)
+    return stampedContainer(file.storebag, rule ? rule->bag.value_or(Stamp()) : Stamp(), directory);
+  std::string bag = formats::writeXMLPropertyList(file.storebag);
   if (sign == Rule::Signature::none) return bag;
   Dictionary container{{"bag", encodeBase64(bag)}};
   if (sign == Rule::Signature::wrong) {
-    std::string signature = key.sign(bag);
+    const auto key = directory.signingKey(kOwnKeys);
+    if (!key) return Failure{key.error()};
+    std::string signature = key.value().sign(bag);
     signature.back() = static_cast<char>(signature.back() ^ 1);
     container.set("signature", encodeBase64(signature));
   }
@@ -42,17 +48,20 @@ std::string httpDate(std::int64_t secondsSince1970) {
   return std::string(text, std::strftime(text, sizeof text, kDateFormat, &parts));
 }
 
-Answer answerWithStorebag(const StorebagFile& file, const config::SigningKey& key, Rule::Signature sign,
-                          int maxAge, const std::string& ifModifiedSince) {
+Answer answerWithStorebag(const StorebagFile& file, const Directory& directory,
+                          const std::optional<Rule>& rule, int maxAge, const std::string& ifModifiedSince) {
   Answer answer;
   answer.type = "application/x-plist";
   answer.headers.set("Last-Modified", httpDate(file.modified));
   answer.headers.set("Cache-Control", "max-age=" + std::to_string(maxAge));
   const auto since = fromHTTPDate(ifModifiedSince);
-  if (since && file.modified <= *since)
+  if (since && file.modified <= *since && !(rule && rule->bag)) {
     answer.status = 304;
-  else
-    answer.body = bodyFor(file.storebag, key, sign);
+    return answer;
+  }
+  auto body = bodyFor(file, directory, rule);
+  if (!body) return answerWithFailure({StorebagFailure::Kind::unreadable, body.error()});
+  answer.body = std::move(body).value();
   return answer;
 }
 

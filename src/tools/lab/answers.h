@@ -23,9 +23,9 @@ struct Answer {
 std::string httpDate(std::int64_t secondsSince1970);
 
 // The signed container, or 304 without a body if the file is not newer than `ifModifiedSince` (which may be
-// empty).
-Answer answerWithStorebag(const StorebagFile& file, const config::SigningKey& key, Rule::Signature sign,
-                          int maxAge, const std::string& ifModifiedSince);
+// empty). A rule with a "bag" makes it newer.
+Answer answerWithStorebag(const StorebagFile& file, const Directory& directory,
+                          const std::optional<Rule>& rule, int maxAge, const std::string& ifModifiedSince);
 // 404 or 500, with the reason as text.
 Answer answerWithFailure(const StorebagFailure& failure);
 // Changes status, body and headers as the rule says.

@@ -12,6 +12,7 @@
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "platform/file_store.h"
+#include "stamp.h"
 
 namespace veltrad::lab {
 namespace {
@@ -86,20 +87,28 @@ Result<Value, std::string> parsed(const std::string& bytes, bool json) {
   return Failure{"no property list: " + value.error().description()};
 }
 
-Result<config::SigningKey, std::string> signingKeyIn(const std::string& directory) {
-  const std::string privatePath = directory + "/private.pem";
+// Makes the pair where the private half is missing, and writes the public one. Returns what failed.
+std::optional<std::string> makePair(const std::string& privatePath, const std::string& publicPath,
+                                    config::SigningKey (*generate)(),
+                                    Result<config::SigningKey, std::string> (*load)(const std::string&)) {
   platform::DiskFileStore files;
   if (!exists(privatePath)) {
-    if (const auto written = files.replace(privatePath, config::SigningKey::generate().privatePEM(), 0600);
-        !written)
-      return Failure{written.error().description};
+    const auto written = files.replace(privatePath, generate().privatePEM(), 0600);
+    if (!written) return written.error().description;
   }
-  auto key = config::SigningKey::load(privatePath);
-  if (!key) return key;
-  if (const auto written = files.replace(directory + "/publicKey.der", key.value().publicDER(), 0644);
-      !written)
-    return Failure{written.error().description};
-  return key;
+  const auto key = load(privatePath);
+  if (!key) return key.error();
+  const auto written = files.replace(publicPath, key.value().publicDER(), 0644);
+  return written ? std::nullopt : std::optional(written.error().description);
+}
+
+std::optional<std::string> makeKeys(const std::string& directory) {
+  const auto generate = [] { return config::SigningKey::generate(); };
+  if (auto failure = makePair(directory + "/private.pem", directory + "/publicKey.der", generate,
+                              config::SigningKey::load))
+    return failure;
+  return makePair(directory + "/ed25519.pem", directory + "/ed25519.der", config::SigningKey::generateEd25519,
+                  config::SigningKey::loadEd25519);
 }
 
 }  // namespace
@@ -116,14 +125,35 @@ Result<Directory, std::string> Directory::open(const std::string& path) {
         !written)
       return Failure{written.error().description};
   }
-  auto key = signingKeyIn(path + "/signing");
-  if (!key) return Failure{key.error()};
-  Directory directory(path, std::move(key).value());
+  if (auto failure = makeKeys(path + "/signing")) return Failure{std::move(*failure)};
+  Directory directory(path);
   if (!exists(directory.certificatePath()) || !exists(directory.certificateKeyPath())) {
     if (const auto failure = makeCertificate(directory.certificatePath(), directory.certificateKeyPath()))
       return Failure{*failure};
   }
   return directory;
+}
+
+std::string Directory::keysOf(const std::string& name) const {
+  return _path + "/signing" + (name == kOwnKeys ? "" : "/" + name);
+}
+
+Result<config::SigningKey, std::string> Directory::signingKey(const std::string& name) const {
+  return config::SigningKey::load(keysOf(name) + "/private.pem");
+}
+
+Result<config::SigningKey, std::string> Directory::ed25519Key(const std::string& name) const {
+  return config::SigningKey::loadEd25519(keysOf(name) + "/ed25519.pem");
+}
+
+Result<StorebagFile, StorebagFailure> Directory::signedStorebag(const std::string& path) const {
+  struct stat status {};
+  platform::DiskFileStore files;
+  auto bytes = files.read(path, 16u << 20);
+  if (!bytes || ::stat(path.c_str(), &status) != 0)
+    return Failure{StorebagFailure{StorebagFailure::Kind::unreadable,
+                                   bytes ? path + ": cannot be read" : bytes.error().description}};
+  return StorebagFile{{}, status.st_mtim.tv_sec, std::move(bytes).value()};
 }
 
 Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& name, const std::string& url,
@@ -132,6 +162,7 @@ Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& nam
   if (!isStorebagName(name))
     return Failure{StorebagFailure{Kind::notFound, "a storebag's name has letters, digits, - and _ only"}};
   const std::string base = _path + "/storebags/" + name;
+  if (exists(base)) return signedStorebag(base);
   const bool json = !exists(base + ".plist");
   const std::string path = base + (json ? ".json" : ".plist");
   struct stat status {};
@@ -144,8 +175,10 @@ Result<StorebagFile, StorebagFailure> Directory::storebag(const std::string& nam
   if (!value) return Failure{StorebagFailure{Kind::unreadable, path + (json ? ":" : ": ") + value.error()}};
   if (const Dictionary* whole = value.value().asDictionary(); whole && whole->string("bag"))
     return Failure{StorebagFailure{
-        Kind::unreadable, path + ": is signed already, and the lab signs what it serves: put the storebag "
-                                 "itself there (veltra-storebag show prints it)"}};
+        Kind::unreadable, path +
+                              ": is signed already, and the lab signs what it serves: put the storebag "
+                              "itself there (veltra-storebag show prints it), or name the file " +
+                              name + ", which is served as it is"}};
   const Value changed = withAddresses(value.value(), url, dashboardPort);
   if (!changed.asDictionary())
     return Failure{StorebagFailure{Kind::unreadable, path + ": a storebag is a dictionary at its top"}};

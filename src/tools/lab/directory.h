@@ -17,6 +17,8 @@ namespace veltrad::lab {
 struct StorebagFile {
   Dictionary storebag;
   std::int64_t modified;
+  // Of a file that is signed already and served as it is; otherwise empty.
+  std::string container = {};
 };
 
 struct StorebagFailure {
@@ -37,19 +39,22 @@ class Directory {
   std::string receivedPath(std::string_view kind) const {
     return _path + "/received/" + std::string(kind) + ".jsonl";
   }
-  const config::SigningKey& signingKey() const { return _signingKey; }
+  std::string ed25519KeyPath() const { return _path + "/signing/ed25519.der"; }
+  // The keys of this name (see stamp.h), read now. The error is one line that names the path.
+  Result<config::SigningKey, std::string> signingKey(const std::string& name) const;
+  Result<config::SigningKey, std::string> ed25519Key(const std::string& name) const;
 
-  // Reads NAME.plist, else NAME.json. Replaces "${url}" in texts by `url`, and a text "${dashboardPort}" by
-  // the number.
+  // Reads NAME, which is signed already, else NAME.plist, else NAME.json. Replaces "${url}" in texts of the
+  // latter by `url`, and a text "${dashboardPort}" by the number.
   Result<StorebagFile, StorebagFailure> storebag(const std::string& name, const std::string& url,
                                                  int dashboardPort) const;
 
  private:
-  Directory(std::string path, config::SigningKey signingKey)
-      : _path(std::move(path)), _signingKey(std::move(signingKey)) {}
+  explicit Directory(std::string path) : _path(std::move(path)) {}
+  std::string keysOf(const std::string& name) const;
+  Result<StorebagFile, StorebagFailure> signedStorebag(const std::string& path) const;
 
   const std::string _path;
-  const config::SigningKey _signingKey;
 };
 
 }  // namespace veltrad::lab

@@ -50,6 +50,7 @@ int serve(const Directory& directory, const Options& options) {
                                  {"dashboardPort", server.dashboardPort()},
                                  {"certificate", directory.certificatePath()},
                                  {"publicKey", directory.publicKeyPath()},
+                                 {"ed25519Key", directory.ed25519KeyPath()},
                                  {"pid", static_cast<long>(getpid())}};
   std::printf("%s\n", veltrad::formats::writeJSON(line).c_str());
   std::fflush(stdout);

@@ -67,6 +67,13 @@ Wrong readBody(const Value& value, std::string& into) {
   return std::nullopt;
 }
 
+Wrong readStamp(const Value& value, std::optional<Stamp>& into) {
+  auto stamp = stampFrom(value);
+  if (!stamp) return stamp.error();
+  into = std::move(stamp).value();
+  return std::nullopt;
+}
+
 Wrong readHeaders(const Value& value, Dictionary& into) {
   const Dictionary* headers = value.asDictionary();
   const auto isText = [](const Dictionary::Entry& entry) { return entry.second.asString() != nullptr; };
@@ -83,6 +90,7 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   if (key == "endless") return readBoolean(value, rule.endless);
   if (key == "lastModified") return readBoolean(value, rule.lastModified);
   if (key == "sign") return readName(value, kSignatures, rule.sign);
+  if (key == "bag") return readStamp(value, rule.bag);
   if (key == "ack") return readName(value, kAcknowledgements, rule.acknowledgement);
   if (key == "headers") return readHeaders(value, rule.headers);
   if (key == "body") return readBody(value, rule.body.emplace());
@@ -92,7 +100,7 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   if (key == "delayMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.delay);
   if (key == "dripMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.drip);
   return "one of path, times, share, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
-         "ack, lastModified, headers, body";
+         "bag, ack, lastModified, headers, body";
 }
 
 }  // namespace

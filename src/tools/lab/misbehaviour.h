@@ -13,10 +13,11 @@
 #include "base/mutex.h"
 #include "base/result.h"
 #include "base/value.h"
+#include "stamp.h"
 
 namespace veltrad::lab {
 
-// Its 16 fields are the keys of a rule (see `veltra-lab --help`) and the generation. A default changes
+// Its 17 fields are the keys of a rule (see `veltra-lab --help`) and the generation. A default changes
 // nothing.
 struct Rule {
   // wrong: one bit is inverted; missing: the container has no "signature"; none: the storebag without a
@@ -41,6 +42,8 @@ struct Rule {
   bool stall = false;
   bool endless = false;
   Signature sign = Signature::right;
+  // Of a storebag that is signed right.
+  std::optional<Stamp> bag;
   Acknowledgement acknowledgement = Acknowledgement::right;
   // Whether there is a "Last-Modified" header.
   bool lastModified = true;

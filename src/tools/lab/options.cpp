@@ -14,9 +14,10 @@ constexpr const char* kAbout =
 log data and uploads. UDP: the dashboard, with acknowledgements.
 Prints one JSON line when it is ready, writes what arrives to DIR/received, and ends on SIGTERM or SIGINT.
 
-  GET    /storebags/maple/NAME   DIR/storebags/NAME.plist or .json, signed. In its texts ${url} is replaced by
-                                 the address of this server; the text ${dashboardPort} becomes the dashboard's
-                                 port as a number
+  GET    /storebags/maple/NAME   DIR/storebags/NAME as it is, if that is there; else NAME.plist or .json, signed
+                                 with both keys in DIR/signing. In its texts ${url} is replaced by the address
+                                 of this server; the text ${dashboardPort} becomes the dashboard's port as a
+                                 number
   POST   /logdata                log data; the answer is the place where it is stored
   POST   /upload                 a gzipped file; the answer is {"success": true}
   POST   /events, /realtime, …   the event collector
@@ -28,6 +29,11 @@ Keys of a rule: path (a prefix), times, share (per cent), status, delayMs, dripM
 the body), cut, cutHalfway, stall, endless, sign (wrong, missing, none), lastModified, headers, body (a text or
 {"$data": base64}). A redirect is a status and a header:
   {"path": "/events", "status": 302, "headers": {"Location": "/there"}}
+"bag" changes a storebag before it is signed, and its keys. It is an object of serial, expires, name, validFor
+(seconds after the clock, instead of expires), clock (a date and time instead of now), key (whose RSA key signs),
+ed25519 (an array: whose Ed25519 keys sign, too) and revoked (an array: whose keys, or fingerprints). Keys are
+those in DIR/signing/NAME, as veltra-storebag keygen makes them, by their NAME; "signing" are those in DIR/signing:
+  {"path": "/storebags", "bag": {"serial": 7, "validFor": 60, "key": "next", "ed25519": ["next"]}}
 For datagrams the path is /dashboard. They use times, share, delayMs and ack, which changes the acknowledgement:
 drop, duplicate, reorder (send it after the next one), short, long, foreign (another event number), stranger
 (from another port):

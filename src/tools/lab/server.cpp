@@ -171,8 +171,7 @@ void Server::Library::storebag(const httplib::Request& request, httplib::Respons
   const auto file = lab._directory.storebag(name, lab._url, lab.dashboardPort());
   if (!file && file.error().kind == StorebagFailure::Kind::unreadable)
     std::fprintf(stderr, "veltra-lab: %s\n", file.error().description.c_str());
-  Answer answer = file ? answerWithStorebag(file.value(), lab._directory.signingKey(),
-                                            rule ? rule->sign : Rule::Signature::right, lab._maxAge,
+  Answer answer = file ? answerWithStorebag(file.value(), lab._directory, rule, lab._maxAge,
                                             request.get_header_value("If-Modified-Since"))
                        : answerWithFailure(file.error());
   if (rule) applyRule(*rule, answer);

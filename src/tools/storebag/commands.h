@@ -22,22 +22,31 @@ struct Outcome {
 // The files that keygen makes. The private key has mode 0600.
 inline constexpr const char* kPrivateKeyFile = "private.pem";
 inline constexpr const char* kPublicKeyFile = "publicKey.der";
+inline constexpr const char* kEd25519PrivateKeyFile = "ed25519.pem";
+inline constexpr const char* kEd25519PublicKeyFile = "ed25519.der";
 
 // Files are named; "-" is standard input.
 
-// Makes the directory if it is missing. Does nothing if either file exists.
-Outcome keygen(const std::string& directory, int bits);
+// Makes the directory if it is missing. Does nothing if either file exists. Prints the fingerprint, too.
+// `bits` is for RSA; `ed25519` makes an Ed25519 key instead.
+Outcome keygen(const std::string& directory, int bits, bool ed25519 = false);
 
 struct SignRequest {
   std::string privateKey, in, out;
   // Signs what lint calls an error, too.
   bool force = false;
+  // What is written into the storebag before it is signed.
+  std::optional<std::int64_t> serial = {};
+  std::optional<std::string> expires = {}, name = {};
+  // Ed25519 private keys that sign as well.
+  std::vector<std::string> ed25519 = {};
 };
-// `in` is a property list, whose bytes are signed unchanged, or JSON, which is converted into an XML property
-// list. Refuses what the daemon would not accept.
+// `in` is a property list, whose bytes are signed unchanged unless something is written into it, or JSON,
+// which is converted into an XML property list. Refuses what the daemon would not accept.
 Outcome sign(const SignRequest& request);
-// Refuses a container that the daemon would not accept, and says which step fails.
-Outcome verify(const std::string& publicKey, const std::string& file);
+// Refuses a container that the daemon would not accept, and says which step fails. `ed25519`: the public key
+// of an Ed25519 signature that must be there, too; empty: none need be.
+Outcome verify(const std::string& publicKey, const std::string& file, const std::string& ed25519 = {});
 // Prints the storebag of a container, without verification, or a bare storebag as JSON.
 Outcome show(const std::string& file, bool compact);
 
@@ -63,18 +72,31 @@ Outcome format(const FormatRequest& request);
 // Prints the JSON Schema of storebags.
 Outcome schema();
 
-// What explain is given besides what `given` holds already. Its 13 fields are its options.
+// For whom a storebag is played, and the files that say more of it.
+struct PlayedSession {
+  Given given;
+  std::optional<std::string> device, policy, messages;
+};
+
 struct ExplainRequest {
   std::string file;
-  Given given;
-  std::vector<std::string> userInfo, draws, payload;
-  std::optional<std::string> device, policy, messages, payloadFile;
+  PlayedSession session;
+  std::vector<std::string> payload;
+  std::optional<std::string> payloadFile;
   std::optional<std::uint16_t> category, type;
   std::int32_t flag = 0;
   bool json = false;
 };
 // Says what each back end does with the messages of such a session.
 Outcome explain(const ExplainRequest& request);
+
+struct DiffRequest {
+  std::string before, now;
+  PlayedSession session;
+  bool json = false;
+};
+// Says what changes between two states of a storebag; `findings`: more leaves devices than before.
+Outcome diff(const DiffRequest& request);
 
 struct TestRequest {
   std::vector<std::string> suites;

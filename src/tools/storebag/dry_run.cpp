@@ -5,7 +5,6 @@
 #include <algorithm>
 
 #include "formats/json.h"
-#include "session/backend_set.h"
 #include "session/start_message.h"
 #include "wire/constants.h"
 
@@ -39,21 +38,13 @@ DryRun::DryRun(const Given& given, const std::string& name, const backends::Shar
   config::StorebagSection section;
   section.backends.emplace(name, profile);
   const Dictionary sessionInfo = sessionInfoOf(given);
-  const auto set = session::createBackends(
-      {_world.factory, _world.device, _world.library, _world.clock, _world.counters, *_word}, &section,
-      &sessionInfo, std::move(facts));
+  const auto set = session::createBackends({_world.factory, _world.device, _world.library, _world.clock,
+                                            _world.counters, *_word, nullptr, false, &_notMade},
+                                           &section, &sessionInfo, std::move(facts));
   if (!set || set->empty()) return;
   _backend = set->begin()->second;
   _backend->updateState();
   session::forbidByWord(*set, *_word);
-}
-
-wire::Reason DryRun::reasonAgainst() const {
-  using enum wire::Reason;
-  for (const wire::Reason reason :
-       {policy_backends, policy_hosts, unknown_backend, no_clients, no_post_url, client_type_not_served})
-    if (_world.counters.value(reason) > 0) return reason;
-  return unknown_backend;
 }
 
 void DryRun::applyPolicy(Dictionary& content, config::EditedFields& edits) const {
@@ -76,9 +67,10 @@ void DryRun::send(const GivenMessage& message) {
   if (payload) applyPolicy(*payload, edits);
   _payloads.push_back(payload.value_or(Dictionary()));
   _edits.push_back(std::move(edits));
-  const std::size_t dropped = droppedSoFar();
+  std::size_t dropped = droppedSoFar();
   const backends::Sent sent =
       _backend->sendMessage(std::move(payload), {}, message.category, message.type, message.flag);
+  if (sent.decision.reason == wire::Reason::post_url_nil) ++dropped;  // itself
   // A device has an energy log.
   const bool written = sent.decision.reason == wire::Reason::energy_log_failed;
   _fates.push_back({written ? wire::Fate::written : sent.decision.fate, std::nullopt});
@@ -89,8 +81,9 @@ void DryRun::send(const GivenMessage& message) {
 
 // Events of a batch that do not leave.
 std::size_t DryRun::droppedSoFar() const {
-  return _world.counters.value(wire::Reason::flushed_unreported) +
-         _world.counters.value(wire::Reason::batch_full);
+  using enum wire::Reason;
+  return _world.counters.value(flushed_unreported) + _world.counters.value(batch_full) +
+         _world.counters.value(post_url_nil);
 }
 
 // `own`: the message whose post is the last one; the posts before it are those of batches.

@@ -10,6 +10,7 @@
 
 #include "config/field_rules.h"
 #include "config/storebag_content.h"
+#include "session/backend_set.h"
 #include "storebag/dry_world.h"
 #include "storebag/explanation.h"
 
@@ -22,7 +23,7 @@ class DryRun {
 
   // Null: the back end is not made, for reasonAgainst().
   const backends::VeltraBackend* backend() const { return _backend.get(); }
-  wire::Reason reasonAgainst() const;
+  wire::Reason reasonAgainst() const { return _notMade.at(0).second; }
   void play();
 
   // By number of the message; 0 is the start message.
@@ -46,6 +47,7 @@ class DryRun {
   const std::shared_ptr<const config::OwnersWord> _word;
   std::optional<Dictionary> _sentUserInfo;
   config::EditedFields _userInfoEdits;
+  session::NotMade _notMade;
   std::shared_ptr<backends::VeltraBackend> _backend;
 
   std::vector<MessageFate> _fates;

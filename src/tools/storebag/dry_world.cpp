@@ -68,8 +68,12 @@ platform::DeviceProperty GivenDevice::value(std::string_view key) {
   return text && !text->empty() ? std::optional(*text) : std::nullopt;
 }
 
+DryMachine::DryMachine(const Given& given, const std::string& backend)
+    : random(drawOf(given, backend)), locale(given.country), properties(withKind(given.device)) {}
+
 DryWorld::DryWorld(const Given& given, const std::string& backend)
-    : draw(drawOf(given, backend)), locale(given.country), properties(withKind(given.device)) {
+    : DryMachine(given, backend),
+      StandaloneServices({posts, clock, random, locale, preferences, properties, files}) {
   const std::string domain(platform::kVeltraPreferenceDomain);
   static_cast<void>(files.replace(
       "/preferences/" + domain + ".plist",
@@ -77,6 +81,9 @@ DryWorld::DryWorld(const Given& given, const std::string& backend)
       0600));
   // Bodies that can be read.
   static_cast<void>(files.replace(root.settingsPath(), R"({"compression": {"level": 0}})", 0600));
+  // The same in every run, so that runs can be compared.
+  static_cast<void>(
+      files.replace(root.secretPath(), std::string(platform::DeviceSecret::kBytes, '\0'), 0600));
   if (given.policy)
     static_cast<void>(files.replace(root.policyPath(), formats::writeJSON(*given.policy), 0600));
   static_cast<void>(gate.refresh());

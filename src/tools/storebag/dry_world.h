@@ -10,18 +10,12 @@
 #include <utility>
 #include <vector>
 
-#include "backends/ampery/energy_log.h"
-#include "backends/backend_factory.h"
-#include "backends/dashboard/work_pool.h"
-#include "backends/mivo/code_bundle.h"
+#include "backends/standalone_services.h"
 #include "config/daily_allowance.h"
-#include "config/operator_settings.h"
 #include "config/owner_gate.h"
 #include "config/owner_policy.h"
-#include "platform/counters.h"
 #include "platform/device_properties.h"
 #include "platform/device_secret.h"
-#include "platform/root.h"
 #include "storebag/given.h"
 
 namespace veltrad::storebag {
@@ -74,32 +68,22 @@ struct GivenDevice final : platform::DeviceProperties {
   const Dictionary properties;
 };
 
-// Its 24 fields are the services, in the order in which they need each other.
-struct DryWorld {
+struct DryMachine {
   // For one back end of one session.
-  DryWorld(const Given& given, const std::string& backend);
+  DryMachine(const Given& given, const std::string& backend);
 
   MemoryFiles files;
   KeptPosts posts;
   StandingClock clock;
-  GivenDraw draw;
+  GivenDraw random;
   GivenLocale locale;
   GivenDevice properties;
-  platform::Counters counters;
   platform::FilePreferences preferences{files, "/preferences"};
-  backends::EnergyLog energyLog{clock, counters, "/nowhere/energy.jsonl"};
-  backends::CodeBundle adaptorBundle{"/nowhere", "none"};
-  backends::WorkPool pool;
-  platform::LentFiles lentFiles;
-  platform::Root root{"/"};
-  support::DeviceIdentity device{properties};
-  config::ProcessSettings settings{preferences, device, files, root.deploymentPath()};
-  config::OperatorSettings choices{files, root.settingsPath()};
-  support::Veltra library{files, preferences, root};
-  const backends::BackendServices services{posts,    clock,     draw,          locale,   preferences,
-                                           counters, energyLog, adaptorBundle, settings, choices,
-                                           device,   library,   pool,          lentFiles};
-  backends::BackendFactory factory{services};
+};
+
+struct DryWorld : DryMachine, backends::StandaloneServices {
+  DryWorld(const Given& given, const std::string& backend);
+
   config::OwnerPolicy policy{files, root.policyPath()};
   platform::DeviceSecret secret{files, root.secretPath()};
   config::DailyAllowance allowance{files, clock, root.allowancePath()};

@@ -15,6 +15,7 @@
 
 #include "base/text.h"
 #include "config/client_entry.h"
+#include "storebag/clientele.h"
 #include "storebag/spelling.h"
 
 namespace veltrad::storebag {
@@ -29,32 +30,10 @@ constexpr const char* kKeepAction = "keep";
 // Of the methods and statuses of events.
 constexpr std::int32_t kMostCode = 65'535;
 
-// In lower case, each once.
-using Names = std::set<std::string>;
-
-Names lowered(const std::vector<std::string>& names) {
-  Names all;
-  for (const std::string& name : names) all.insert(lowerCase(name));
-  return all;
-}
-
-// Whom an entry fits. An empty list is everyone.
-struct Clientele {
+// An entry's clientele, and its number.
+struct Numbered : Clientele {
+  Numbered(std::size_t place, const ClientEntry& entry) : Clientele(entry), number(place) {}
   std::size_t number;
-  Names clients;
-  Names services;
-
-  bool isSameAs(const Clientele& other) const {
-    return clients == other.clients && services == other.services;
-  }
-  // Whether it fits every client of this name with a service whose name holds this text; null: any.
-  bool fits(const std::string* client, const std::string* service) const {
-    if (!clients.empty() && (client == nullptr || !clients.contains(*client))) return false;
-    if (services.empty()) return true;
-    return service != nullptr && std::any_of(services.begin(), services.end(), [&](const std::string& own) {
-             return service->find(own) != std::string::npos;
-           });
-  }
 };
 
 std::vector<const std::string*> eachOf(const Names& names) {
@@ -71,12 +50,12 @@ bool hasWrongNames(const Dictionary& entry) {
 }
 
 // The entries above that together fit everyone whom `entry` fits; empty if someone is left.
-std::set<std::size_t> shadowsOf(const Clientele& entry, const std::vector<Clientele>& above) {
+std::set<std::size_t> shadowsOf(const Clientele& entry, const std::vector<Numbered>& above) {
   std::set<std::size_t> shadows;
   for (const std::string* client : eachOf(entry.clients)) {
     for (const std::string* service : eachOf(entry.services)) {
       const auto at = std::find_if(above.begin(), above.end(),
-                                   [&](const Clientele& other) { return other.fits(client, service); });
+                                   [&](const Numbered& other) { return other.fits(client, service); });
       if (at == above.end()) return {};
       shadows.insert(at->number);
     }
@@ -141,14 +120,13 @@ struct EntryCheck::Filter {
 };
 
 void EntryCheck::checkEntries(const Spot& at, const Array& entries) const {
-  std::vector<Clientele> above;
+  std::vector<Numbered> above;
   for (std::size_t i = 0; i < entries.size(); ++i) {
     const Dictionary* dictionary = entries[i].asDictionary();
     if (dictionary == nullptr || hasWrongNames(*dictionary)) continue;
-    const auto parsed = config::parsed<ClientEntry>(*dictionary);
-    const Clientele entry{i, lowered(parsed.client), lowered(parsed.service)};
-    const auto same = std::find_if(above.begin(), above.end(),
-                                   [&](const Clientele& other) { return entry.isSameAs(other); });
+    const Numbered entry(i, config::parsed<ClientEntry>(*dictionary));
+    const auto same =
+        std::find_if(above.begin(), above.end(), [&](const Clientele& other) { return entry == other; });
     if (same != above.end()) {
       _sink.say(
           duplicate_entry, at.element(i),

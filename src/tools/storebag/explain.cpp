@@ -2,17 +2,16 @@
 // Tells of each back end what a dry run shows.
 #include <algorithm>
 #include <cmath>
-#include <limits>
 
 #include "backends/dashboard/packet_text.h"
 #include "backends/dashboard/udp_socket.h"
 #include "backends/https/https_post_backend.h"
-#include "backends/https/text_lists.h"
 #include "config/client_types.h"
 #include "config/storebag_section.h"
-#include "platform/log.h"
 #include "storebag/dry_run.h"
 #include "storebag/explanation.h"
+#include "storebag/null_value.h"
+#include "storebag/silence.h"
 #include "wire/constants.h"
 
 namespace veltrad::storebag {
@@ -28,7 +27,7 @@ constexpr std::uint32_t kReleaseEnvironment = 4;
 constexpr const char* kFactsOfARun[] = {"_startTS",   "_clientTS",       "eventTime",
                                         "_sessionID", "_timezoneOffset", "_reportVers"};
 
-const Value kUnknown(std::numeric_limits<double>::quiet_NaN());
+const Value kUnknown = unknownValue();
 
 bool isContainer(const Value& value) {
   return value.asArray() || value.asDictionary() || value.asData();
@@ -53,37 +52,6 @@ SharedProfile withoutFilters(const config::HTTPSPostProfile& profile) {
   return std::make_shared<const config::Profile>(std::move(bare));
 }
 
-std::optional<std::string> nameIn(const Given& given, const char* key) {
-  const std::string* name = given.userInfo ? given.userInfo->string(key) : nullptr;
-  return name ? std::optional(*name) : std::nullopt;
-}
-
-// The entry that decides or, if the session requires no user info, gives the address; else the nearest.
-void matchEntry(const std::vector<ClientEntry>& clients, const Given& given, BackendExplanation& told) {
-  if (!given.requireUserInfo) {
-    const auto taken = std::find_if(clients.begin(), clients.end(),
-                                    [](const ClientEntry& entry) { return entry.postURL.has_value(); });
-    if (taken != clients.end()) told.entry = static_cast<std::size_t>(taken - clients.begin());
-    return;
-  }
-  if (!given.userInfo) return;
-  const auto client = nameIn(given, wire::kVeltraUserInfoClientName);
-  const auto service = nameIn(given, wire::kVeltraUserInfoServiceName);
-  for (std::size_t i = 0; i < clients.size(); ++i) {
-    NearestEntry candidate{i, {}};
-    if (!backends::matchExactStringWithList(clients[i].client, client, true))
-      candidate.differs.emplace_back("client");
-    if (!backends::matchStringWithList(clients[i].service, service, true))
-      candidate.differs.emplace_back("service");
-    if (candidate.differs.empty()) {
-      told.entry = i;
-      told.nearest.reset();
-      return;
-    }
-    if (!told.nearest || candidate.differs.size() < told.nearest->differs.size()) told.nearest = candidate;
-  }
-}
-
 double chanceOf(const BackendExplanation& told) {
   switch (told.reason) {
     case Reason::reports:
@@ -97,7 +65,7 @@ double chanceOf(const BackendExplanation& told) {
 
 // What filters did: `plain` is the same message without them.
 void compareEvents(const Dictionary& filtered, const Dictionary& plain, const Dictionary& original,
-                   BackendExplanation& told) {
+                   LeavingEvent& told) {
   for (const auto& [key, value] : plain) {
     const Value* left = filtered.find(key);
     const Value* first = original.find(key);
@@ -109,7 +77,8 @@ void compareEvents(const Dictionary& filtered, const Dictionary& plain, const Di
 }
 
 // What the owner's policy did.
-void addEdits(const config::EditedFields& edits, BackendExplanation& told) {
+template <typename Told>
+void addEdits(const config::EditedFields& edits, Told& told) {
   told.removed.insert(edits.removed.begin(), edits.removed.end());
   told.hashed.insert(edits.hashed.begin(), edits.hashed.end());
 }
@@ -146,21 +115,22 @@ void tellEvents(const DryRun& run, const Given& given, const std::string& name,
     Dictionary original =
         message > 0 ? given.messages[message - 1].payload.value_or(Dictionary()) : Dictionary();
     if (given.userInfo) original.merge(*given.userInfo);
-    compareEvents(withFilters->second, without->second, original, told);
-    addEdits(run.editsOf(message), told);
-    told.events.push_back(event);
-    told.messageOfEvent.push_back(message);
-    hideFactsOfARun(run, without->second, message, told.events.back());
+    LeavingEvent left{event, message, {}, {}};
+    compareEvents(withFilters->second, without->second, original, left);
+    addEdits(run.editsOf(message), left);
+    addEdits(run.userInfoEdits(), left);
+    for (const std::string& key : left.removed) left.hashed.erase(key);
+    hideFactsOfARun(run, without->second, message, left.fields);
+    told.removed.insert(left.removed.begin(), left.removed.end());
+    told.hashed.insert(left.hashed.begin(), left.hashed.end());
+    told.events.push_back(std::move(left));
   }
-  addEdits(run.userInfoEdits(), told);
-  for (const std::string& key : told.removed) told.hashed.erase(key);
 }
 
-void tellHTTPS(const DryRun& run, const Given& given, const config::HTTPSPostProfile& profile,
-               BackendExplanation& told) {
+void tellHTTPS(const DryRun& run, BackendExplanation& told) {
   const auto& backend = static_cast<const backends::HTTPSPostBackend&>(*run.backend());
   const backends::HTTPSPostState& state = backend.clientState();
-  matchEntry(*profile.clients, given, told);
+  told.match = state.match();
   told.threshold = backend.samplingThreshold();
   told.hierarchy = backend.hierarchy();
   told.batched = state.batchEvents(*backend.facts());
@@ -182,7 +152,7 @@ BackendExplanation explainBackend(const Given& given, const std::string& name, c
   told.reason = verdict.reason;
   const auto* https = profile ? std::get_if<config::HTTPSPostProfile>(profile.get()) : nullptr;
   const auto* upload = profile ? std::get_if<config::UploadProfile>(profile.get()) : nullptr;
-  if (https) tellHTTPS(run, given, *https, told);
+  if (https) tellHTTPS(run, told);
   if (upload) told.url = upload->postURL;
   told.chance = chanceOf(told);
   if (name == wire::kVeltraBackendMivo) {
@@ -192,7 +162,10 @@ BackendExplanation explainBackend(const Given& given, const std::string& name, c
     return told;
   }
   run.play();
-  for (std::size_t i = 0; i < given.messages.size(); ++i) told.fates.push_back(run.fateOf(i + 1));
+  for (std::size_t i = 0; i < given.messages.size(); ++i) {
+    told.fates.push_back(run.fateOf(i + 1));
+    if (told.fates.back().fate == wire::Fate::written) addEdits(run.editsOf(i + 1), told);
+  }
   if (https) tellEvents(run, given, name, *https, told);
   return told;
 }
@@ -232,15 +205,6 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
   }
   return told;
 }
-
-// The lines of the daemon's log are not what was asked for.
-class Silence {
- public:
-  Silence() {
-    platform::log::setSink([](platform::LogLevel, std::string_view) {});
-  }
-  ~Silence() { platform::log::setSink(nullptr); }
-};
 
 }  // namespace
 

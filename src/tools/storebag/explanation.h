@@ -9,29 +9,32 @@
 #include <string>
 #include <vector>
 
+#include "backends/client_match.h"
 #include "storebag/given.h"
 #include "wire/fates.h"
 
 namespace veltrad::storebag {
-
-// A client entry that does not fit, and by what.
-struct NearestEntry {
-  std::size_t entry = 0;
-  std::vector<std::string> differs;
-};
 
 struct MessageFate {
   wire::Fate fate = wire::Fate::none;
   std::optional<std::string> url;
 };
 
-// Its 17 fields are those of the JSON form and which message an event is of.
+// An event that leaves. NaN stands for what only a run knows.
+struct LeavingEvent {
+  Dictionary fields;
+  // Its message, from 1; 0 is the start message.
+  std::size_t message = 0;
+  // Names of the message's fields and of the user info's.
+  std::set<std::string> removed, hashed;
+};
+
+// Its 15 fields are those of the JSON form.
 struct BackendExplanation {
   // Before the messages; absent: the back end is not made.
   std::optional<std::int32_t> state;
   wire::Reason reason = wire::Reason::always;
-  std::optional<std::size_t> entry;
-  std::optional<NearestEntry> nearest;
+  backends::ClientMatch match;
   std::optional<double> threshold;
   // The share of devices that report.
   double chance = 0;
@@ -39,13 +42,11 @@ struct BackendExplanation {
   bool batched = false;
   std::optional<std::int32_t> eventThreshold;
   std::optional<std::string> url, realtimeUrl;
-  // Those that leave, in the order of the messages. NaN stands for what only a run knows.
-  std::vector<Dictionary> events;
-  // From 1; 0 is the start message.
-  std::vector<std::size_t> messageOfEvent;
+  // In the order of the messages.
+  std::vector<LeavingEvent> events;
   // One a message.
   std::vector<MessageFate> fates;
-  // Names of fields.
+  // Of all events and datagrams.
   std::set<std::string> removed, hashed;
   // Of the datagrams, one a message.
   std::vector<std::string> texts;

@@ -2,27 +2,13 @@
 // Says an explanation as JSON and to people.
 #include <fmt/format.h>
 
-#include <limits>
-
 #include "formats/json.h"
 #include "storebag/explanation.h"
-#include "storebag/lint_sink.h"
+#include "storebag/null_value.h"
+#include "storebag/words.h"
 
 namespace veltrad::storebag {
 namespace {
-
-// JSON has null for it.
-Value unknown() {
-  return std::numeric_limits<double>::quiet_NaN();
-}
-
-template <typename T>
-Value orNull(const std::optional<T>& value) {
-  return value ? Value(*value) : unknown();
-}
-Value orNull(const std::optional<std::size_t>& value) {
-  return value ? Value(static_cast<std::uint64_t>(*value)) : unknown();
-}
 
 template <typename List>
 Array arrayOf(const List& items) {
@@ -38,10 +24,11 @@ Array fatesOf(const BackendExplanation& told) {
   return array;
 }
 
-std::string listedNames(const std::set<std::string>& names) {
-  std::string text;
-  for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
-  return text;
+std::vector<std::string> differencesOf(const backends::ClientMatch& match) {
+  std::vector<std::string> differs;
+  if (match.clientDiffers) differs.emplace_back("client");
+  if (match.serviceDiffers) differs.emplace_back("service");
+  return differs;
 }
 
 std::string headline(const std::string& name, const BackendExplanation& told) {
@@ -51,17 +38,16 @@ std::string headline(const std::string& name, const BackendExplanation& told) {
                      wire::causeOf(told.reason), wire::entryOf(told.reason).name);
 }
 
-std::string entryLine(const BackendExplanation& told) {
-  if (told.entry) return fmt::format("  entry clients[{}]\n", *told.entry);
-  if (!told.nearest) return "";
-  std::string differs;
-  for (const std::string& key : told.nearest->differs) differs += (differs.empty() ? "" : " and ") + key;
-  return fmt::format("  no entry fits; the nearest is clients[{}], whose {} differs\n", told.nearest->entry,
-                     differs);
+std::string entryLine(const backends::ClientMatch& match) {
+  if (match.entry) return fmt::format("  entry clients[{}]\n", *match.entry);
+  if (!match.nearest) return "";
+  return fmt::format("  no entry fits; the nearest is clients[{}], whose {} {}\n", *match.nearest,
+                     listedWithAnd(differencesOf(match)),
+                     match.clientDiffers && match.serviceDiffers ? "differ" : "differs");
 }
 
 std::string backendText(const std::string& name, const BackendExplanation& told) {
-  std::string text = headline(name, told) + "\n" + entryLine(told);
+  std::string text = headline(name, told) + "\n" + entryLine(told.match);
   if (!told.state) return text;
   text += fmt::format("  {:.4g} % of devices report", told.chance * 100);
   if (told.threshold) text += fmt::format(" (threshold {})", *told.threshold);
@@ -72,26 +58,27 @@ std::string backendText(const std::string& name, const BackendExplanation& told)
   if (told.batched)
     text +=
         fmt::format("  in batches, flushed above {} events of a method\n", told.eventThreshold.value_or(0));
-  if (!told.removed.empty()) text += fmt::format("  removed: {}\n", listedNames(told.removed));
-  if (!told.hashed.empty()) text += fmt::format("  hashed: {}\n", listedNames(told.hashed));
+  if (!told.removed.empty()) text += fmt::format("  removed: {}\n", listed(told.removed));
+  if (!told.hashed.empty()) text += fmt::format("  hashed: {}\n", listed(told.hashed));
   for (std::size_t i = 0; i < told.fates.size(); ++i)
     text += fmt::format("  message {}: {}{}\n", i + 1, wire::nameOf(told.fates[i].fate),
                         i < told.texts.size() ? " \"" + told.texts[i] + "\"" : "");
-  for (const Dictionary& event : told.events)
-    text += fmt::format("  leaves: {}\n", formats::writeJSON(event));
+  for (const LeavingEvent& event : told.events)
+    text += fmt::format("  leaves: {}\n", formats::writeJSON(event.fields));
   return text;
 }
 
 }  // namespace
 
 Dictionary asDictionary(const BackendExplanation& told) {
-  Value nearest = unknown();
-  if (told.nearest)
-    nearest = Dictionary{{"entry", static_cast<std::uint64_t>(told.nearest->entry)},
-                         {"differs", arrayOf(told.nearest->differs)}};
+  Value nearest = unknownValue();
+  if (told.match.nearest)
+    nearest = Dictionary{{"entry", *told.match.nearest}, {"differs", arrayOf(differencesOf(told.match))}};
+  Array events;
+  for (const LeavingEvent& event : told.events) events.emplace_back(event.fields);
   return {{"state", orNull(told.state)},
           {"reason", wire::entryOf(told.reason).name},
-          {"entry", orNull(told.entry)},
+          {"entry", orNull(told.match.entry)},
           {"nearest", nearest},
           {"threshold", orNull(told.threshold)},
           {"chance", told.chance},
@@ -100,7 +87,7 @@ Dictionary asDictionary(const BackendExplanation& told) {
           {"eventThreshold", orNull(told.eventThreshold)},
           {"url", orNull(told.url)},
           {"realtimeUrl", orNull(told.realtimeUrl)},
-          {"events", arrayOf(told.events)},
+          {"events", std::move(events)},
           {"fates", fatesOf(told)},
           {"removed", arrayOf(told.removed)},
           {"hashed", arrayOf(told.hashed)},
@@ -117,7 +104,8 @@ Dictionary asDictionary(const Explanation& explanation) {
 }
 
 std::string textOf(const Explanation& explanation) {
-  if (!explanation.storebag) return "Nothing is reported: this client type has no storebag.\n";
+  if (!explanation.storebag)
+    return "Nothing is reported: this client type has no storebag; --client-type 5 to 17 have one.\n";
   if (!explanation.section) return "Nothing is reported: the storebag has no section for this environment.\n";
   std::string text = fmt::format("storebag {}, version {}, section {}\n", *explanation.storebag,
                                  explanation.version.value_or("none"), *explanation.section);

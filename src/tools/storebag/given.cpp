@@ -8,10 +8,17 @@
 #include <utility>
 
 #include "config/client_types.h"
+#include "config/policy.h"
+#include "config/storebag_content.h"
 #include "formats/json.h"
+#include "platform/local_settings.h"
+#include "platform/locale.h"
 #include "storebag/document.h"
 #include "storebag/lint_sink.h"
+#include "storebag/recording.h"
 #include "storebag/spelling.h"
+#include "storebag/words.h"
+#include "tools/key_value.h"
 #include "wire/constants.h"
 
 namespace veltrad::storebag {
@@ -41,36 +48,66 @@ std::optional<std::string> readUserInfo(const Value& value, Given& given) {
   return std::nullopt;
 }
 
+std::optional<std::string> inKey(const char* key, const std::optional<std::string>& fault) {
+  return fault ? std::optional(fmt::format("\"{}\": {}", key, *fault)) : std::nullopt;
+}
+
 std::optional<std::string> readDraw(const Value& value, Given& given) {
-  if (value.isNumber()) {
-    given.draw = *value.toDouble();
-    return std::nullopt;
-  }
   const Dictionary* draws = value.asDictionary();
-  if (draws == nullptr) return expected("draw", value, "a number from 0 to 1, or one by back end").error;
-  for (const auto& [name, draw] : *draws) {
-    if (!draw.isNumber()) return expected("draw", draw, "a number from 0 to 1").error;
-    given.draws[name] = *draw.toDouble();
+  if (draws == nullptr) return inKey("draw", given.takeDraw("", value));
+  std::optional<std::string> fault;
+  for (const auto& [name, draw] : *draws)
+    if (!fault) fault = inKey("draw", given.takeDraw(name, draw));
+  return fault;
+}
+
+std::string mostLike(const std::string& name, const std::vector<std::string>& known) {
+  const auto meant = closestName(name, known);
+  return meant ? fmt::format(": did you mean {}?", quoted(*meant))
+               : fmt::format(": expected one of {}", listed(known));
+}
+
+Result<Dictionary, std::string> checkedDevice(Dictionary device, const std::string& where) {
+  static const std::vector<std::string> kKnown{"ProductVersion", "BuildVersion", "ProductType",
+                                               "DeviceName",     "HWModelStr",   "SerialNumber",
+                                               "UniqueDeviceID", "ReleaseType"};
+  for (const auto& [key, value] : device) {
+    if (std::find(kKnown.begin(), kKnown.end(), key) == kKnown.end())
+      return Failure{fmt::format("{}: unknown key {}{}", where, quoted(key), mostLike(key, kKnown))};
+    if (!value.asString()) return Failure{where + ": " + expected(key, value, "a text").error};
   }
-  return std::nullopt;
+  return device;
 }
 
-// A dictionary, or the path of a file that holds one.
-Result<Dictionary, std::string> dictionaryIn(const std::string& key, const Value& value,
-                                             const std::string& directory) {
-  if (const Dictionary* dictionary = value.asDictionary()) return *dictionary;
+Result<Dictionary, std::string> checkedPolicy(platform::LocalContent content) {
+  content.kind = platform::LocalContent::Kind::good;
+  std::string error;
+  if (!config::Policy::of(content, error)) return Failure{error};
+  return *content.value.asDictionary();
+}
+
+// An object, or the path of a file that holds one.
+Result<Dictionary, std::string> deviceIn(const Value& value, const std::string& directory) {
+  if (const Dictionary* device = value.asDictionary()) return checkedDevice(*device, "\"device\"");
   const std::string* path = value.asString();
-  if (path == nullptr) return expected(key, value, "an object or the path of a file");
-  return readDictionary(pathBeside(directory, *path));
+  if (path == nullptr) return expected("device", value, "an object or the path of a file");
+  return readDevice(pathBeside(directory, *path));
 }
 
-std::optional<std::string> readMessages(const Value& value, const std::string& directory, Given& given) {
+Result<Dictionary, std::string> policyIn(const Value& value, const std::string& directory) {
+  const std::string* path = value.asString();
+  if (path != nullptr) return readPolicy(pathBeside(directory, *path));
+  if (value.asDictionary() == nullptr) return expected("policy", value, "an object or the path of a file");
+  platform::LocalContent content;
+  content.value = value;
+  content.path = "\"policy\"";
+  return checkedPolicy(std::move(content));
+}
+
+std::optional<std::string> takeMessages(const Value& value, const std::string& directory, Given& given) {
   if (const std::string* path = value.asString()) {
-    const std::string file = pathBeside(directory, *path);
-    const auto lines = readBytes(file);
-    if (!lines) return lines.error();
-    auto messages = messagesIn(lines.value());
-    if (!messages) return file + ":" + messages.error();
+    auto messages = readMessages(pathBeside(directory, *path));
+    if (!messages) return messages.error();
     given.messages = std::move(messages).value();
     return std::nullopt;
   }
@@ -90,6 +127,12 @@ struct GivenKey {
   std::optional<std::string> (*read)(const Value&, const std::string& directory, Given&);
 };
 
+std::optional<std::string> readName(const char* key, const char* name, const Value& value, Given& given) {
+  if (!value.asString()) return expected(key, value, "a text").error;
+  given.setUserInfo(name, value);
+  return std::nullopt;
+}
+
 std::optional<std::string> readFlag(const char* key, const Value& value, bool& flag) {
   if (!value.isBoolean()) return expected(key, value, "true or false").error;
   flag = *value.toBoolean();
@@ -105,23 +148,16 @@ constexpr GivenKey kKeys[] = {
        return std::nullopt;
      }},
     {"environment",
-     [](const Value& value, const std::string&, Given& given) -> std::optional<std::string> {
-       const auto environment = environmentNamed(value.toText().value_or(""));
-       if (!environment) return environment.error();
-       given.environment = environment.value();
-       return std::nullopt;
+     [](const Value& value, const std::string&, Given& given) {
+       return inKey("environment", given.takeEnvironment(value.toText().value_or("")));
      }},
     {"client",
-     [](const Value& value, const std::string&, Given& given) -> std::optional<std::string> {
-       if (!value.asString()) return expected("client", value, "a text").error;
-       given.setUserInfo(wire::kVeltraUserInfoClientName, value);
-       return std::nullopt;
+     [](const Value& value, const std::string&, Given& given) {
+       return readName("client", wire::kVeltraUserInfoClientName, value, given);
      }},
     {"service",
-     [](const Value& value, const std::string&, Given& given) -> std::optional<std::string> {
-       if (!value.asString()) return expected("service", value, "a text").error;
-       given.setUserInfo(wire::kVeltraUserInfoServiceName, value);
-       return std::nullopt;
+     [](const Value& value, const std::string&, Given& given) {
+       return readName("service", wire::kVeltraUserInfoServiceName, value, given);
      }},
     {"userInfo",
      [](const Value& value, const std::string&, Given& given) { return readUserInfo(value, given); }},
@@ -132,25 +168,23 @@ constexpr GivenKey kKeys[] = {
     {"batchEvents", [](const Value& value, const std::string&,
                        Given& given) { return readFlag("batchEvents", value, given.batchEvents); }},
     {"country",
-     [](const Value& value, const std::string&, Given& given) -> std::optional<std::string> {
-       if (!value.asString()) return expected("country", value, "a text like \"US\"").error;
-       given.country = *value.asString();
-       return std::nullopt;
+     [](const Value& value, const std::string&, Given& given) {
+       return inKey("country", given.takeCountry(value.toText().value_or("")));
      }},
     {"consent", [](const Value& value, const std::string&,
                    Given& given) { return readFlag("consent", value, given.consent); }},
     {"device",
      [](const Value& value, const std::string& directory, Given& given) -> std::optional<std::string> {
-       auto device = dictionaryIn("device", value, directory);
+       auto device = deviceIn(value, directory);
        if (!device) return device.error();
        given.device = std::move(device).value();
        return std::nullopt;
      }},
     {"draw", [](const Value& value, const std::string&, Given& given) { return readDraw(value, given); }},
-    {"messages", readMessages},
+    {"messages", takeMessages},
     {"policy",
      [](const Value& value, const std::string& directory, Given& given) -> std::optional<std::string> {
-       auto policy = dictionaryIn("policy", value, directory);
+       auto policy = policyIn(value, directory);
        if (!policy) return policy.error();
        given.policy = std::move(policy).value();
        return std::nullopt;
@@ -164,13 +198,49 @@ void Given::setUserInfo(std::string key, Value value) {
   userInfo->set(std::move(key), std::move(value));
 }
 
-Result<std::uint32_t, std::string> environmentNamed(const std::string& name) {
-  std::string known;
+std::optional<std::string> Given::takeUserInfo(const std::string& text) {
+  auto entry = tools::parseKeyValue(text);
+  if (!entry) return entry.error();
+  setUserInfo(std::move(entry.value().first), std::move(entry.value().second));
+  return std::nullopt;
+}
+
+std::optional<std::string> Given::takeEnvironment(const std::string& name) {
+  std::vector<std::string> known;
   for (std::uint32_t number = 1; const char* section = config::sectionNameForEnvironment(number); ++number) {
-    if (name == section || name == std::to_string(number)) return number;
-    known += (known.empty() ? "" : ", ") + std::string(section);
+    if (name == section || name == std::to_string(number)) {
+      environment = number;
+      return std::nullopt;
+    }
+    known.emplace_back(section);
   }
-  return Failure{fmt::format("{} is no environment: expected one of {}", quoted(name), known)};
+  return fmt::format("{} is no environment{}", quoted(name), mostLike(name, known));
+}
+
+std::optional<std::string> Given::takeCountry(const std::string& code) {
+  country = platform::countryOfLocaleName("xx_" + code);
+  if (country) return std::nullopt;
+  return fmt::format("{} is no country: expected two letters like US, or three digits", quoted(code));
+}
+
+std::optional<std::string> Given::takeDraw(const std::string& text) {
+  const std::size_t equals = text.find('=');
+  const bool named = equals != std::string::npos;
+  const std::string number = named ? text.substr(equals + 1) : text;
+  const auto read = formats::parseJSON(number);
+  return takeDraw(named ? text.substr(0, equals) : "", read ? read.value() : Value(number));
+}
+
+std::optional<std::string> Given::takeDraw(const std::string& backend, const Value& factor) {
+  std::vector<std::string> known;
+  for (const config::Key& key : config::StorebagSection::kKeys) known.emplace_back(key.name);
+  if (!backend.empty() && std::find(known.begin(), known.end(), backend) == known.end())
+    return fmt::format("unknown back end {}{}", quoted(backend), mostLike(backend, known));
+  const auto number = factor.isNumber() ? factor.toDouble() : std::nullopt;
+  if (!number || *number < 0 || *number > 1)
+    return fmt::format("{} is no sampling factor: expected a number from 0 to 1", shownValue(factor));
+  (backend.empty() ? draw : draws[backend]) = *number;
+  return std::nullopt;
 }
 
 Result<GivenMessage, std::string> messageOf(const Value& value) {
@@ -194,33 +264,27 @@ Result<GivenMessage, std::string> messageOf(const Value& value) {
   return given;
 }
 
-Result<std::vector<GivenMessage>, std::string> messagesIn(std::string_view lines) {
-  std::vector<GivenMessage> messages;
-  for (std::size_t number = 1; !lines.empty(); ++number) {
-    const std::size_t end = std::min(lines.find('\n'), lines.size());
-    const std::string_view line = trimmed(lines.substr(0, end));
-    lines.remove_prefix(std::min(end + 1, lines.size()));
-    if (line.empty()) continue;
-    const auto value = formats::parseJSON(line);
-    if (!value)
-      return Failure{fmt::format("{}:{}: {}", number, value.error().offset + 1, value.error().detail)};
-    const Dictionary* object = value.value().asDictionary();
-    const std::string* event = object ? object->string("event") : nullptr;
-    const std::string* operation = object ? object->string("op") : nullptr;
-    if (!(event && *event == "message") && !(operation && *operation == "send")) continue;
-    auto message = messageOf(value.value());
-    if (!message) return Failure{fmt::format("{}:1: {}", number, message.error())};
-    messages.push_back(std::move(message).value());
-  }
-  return messages;
-}
-
 Result<Dictionary, std::string> readDictionary(const std::string& file) {
   const auto document = readDocument(file);
   if (!document) return Failure{document.error().line()};
   const Dictionary* dictionary = document.value().content.asDictionary();
   if (dictionary == nullptr) return Failure{file + ":1:1: expected an object"};
   return *dictionary;
+}
+
+Result<Dictionary, std::string> readDevice(const std::string& file) {
+  auto device = readDictionary(file);
+  return device ? checkedDevice(std::move(device).value(), file) : device;
+}
+
+Result<Dictionary, std::string> readPolicy(const std::string& file) {
+  auto document = readDocument(file);
+  if (!document) return Failure{document.error().line()};
+  platform::LocalContent content;
+  content.path = file;
+  content.value = std::move(document.value().content);
+  content.bytes = std::move(document.value().bytes);
+  return checkedPolicy(std::move(content));
 }
 
 Result<Given, std::string> givenOf(const Dictionary& dictionary, const std::string& directory) {
@@ -234,9 +298,7 @@ Result<Given, std::string> givenOf(const Dictionary& dictionary, const std::stri
   }
   for (const auto& [name, value] : dictionary) {
     if (std::find(known.begin(), known.end(), name) != known.end()) continue;
-    const auto meant = closestName(name, known);
-    return Failure{fmt::format("unknown key {} in \"given\"{}", quoted(name),
-                               meant ? ": did you mean " + quoted(*meant) + "?" : "")};
+    return Failure{fmt::format("unknown key {} in \"given\"{}", quoted(name), mostLike(name, known))};
   }
   return given;
 }

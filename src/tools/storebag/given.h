@@ -43,17 +43,24 @@ struct Given {
   std::vector<GivenMessage> messages;
 
   void setUserInfo(std::string key, Value value);
+  // These take what people write, and return what is wrong with it: KEY=VALUE; the section or number of an
+  // environment; the country of a locale, "US" or "419" in letters of any case; a sampling factor from 0 to
+  // 1, or NAME=X of one back end.
+  std::optional<std::string> takeUserInfo(const std::string& text);
+  std::optional<std::string> takeEnvironment(const std::string& name);
+  std::optional<std::string> takeCountry(const std::string& code);
+  std::optional<std::string> takeDraw(const std::string& text);
+  // An empty name is that of all back ends.
+  std::optional<std::string> takeDraw(const std::string& backend, const Value& factor);
 };
 
-// The environment that a section is for: its name, or its number as text.
-Result<std::uint32_t, std::string> environmentNamed(const std::string& name);
 // {"category", "type", "flag", "payload"}; the error says what is wrong.
 Result<GivenMessage, std::string> messageOf(const Value& message);
-// The messages in lines of `veltractl watch --json --contents` or of `veltractl session`; others are passed
-// over. The error names the line.
-Result<std::vector<GivenMessage>, std::string> messagesIn(std::string_view lines);
 // A file that holds one dictionary, as JSON with comments or a property list. The error names the file.
 Result<Dictionary, std::string> readDictionary(const std::string& file);
+// The same for what device.plist and policy.json say; what the daemon would not take is an error.
+Result<Dictionary, std::string> readDevice(const std::string& file);
+Result<Dictionary, std::string> readPolicy(const std::string& file);
 // "given" of a case; paths in it are relative to `directory`. The error names the key.
 Result<Given, std::string> givenOf(const Dictionary& given, const std::string& directory);
 

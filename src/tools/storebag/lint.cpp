@@ -12,6 +12,7 @@
 #include "storebag/entry_check.h"
 #include "storebag/spelling.h"
 #include "storebag/value_check.h"
+#include "storebag/words.h"
 #include "wire/constants.h"
 
 namespace veltrad::storebag {
@@ -26,12 +27,6 @@ std::vector<std::string> namesOf(const KeyTable& table) {
   std::vector<std::string> names;
   for (const Key& key : table) names.emplace_back(key.name);
   return names;
-}
-
-std::string listed(const std::vector<std::string>& names) {
-  std::string text;
-  for (const std::string& name : names) text += (text.empty() ? "" : ", ") + name;
-  return text;
 }
 
 FindingName unknownIn(const KeyTable& table, const Value* value) {
@@ -111,6 +106,14 @@ class Lint {
   // The key that was probably meant, or null.
   const Key* checkUnknown(const Spot& at, const std::string& name, const Value* value,
                           const KeyTable& table) {
+    if (&table == &config::Storebag::kKeys) {
+      if (const Key* backend = config::StorebagSection::kKeys.find(name)) {
+        _sink.say(unknown_section, at.key(name),
+                  fmt::format("{} is a back end, and stands in no section", quoted(name)),
+                  fmt::format("Put it into one: \"release\": {{{}: …}}.", quoted(name)));
+        return backend;
+      }
+    }
     const FindingName unknown = unknownIn(table, value);
     const std::vector<std::string> known = namesOf(table);
     const auto meant = closestName(name, known);

@@ -49,7 +49,10 @@ void describeKeys(CLI::App& app, Arguments& given) {
   keygen->add_option("--bits", given.bits, "Length of the modulus in bits")
       ->check(CLI::Range(SigningKey::kFewestBits, SigningKey::kMostBits))
       ->capture_default_str();
-  keygen->callback([&given] { given.outcome = storebag::keygen(given.directory, given.bits); });
+  keygen->add_flag("--ed25519", given.ed25519Key,
+                   "Create one for the second signature instead: DIR/ed25519.pem and DIR/ed25519.der");
+  keygen->callback(
+      [&given] { given.outcome = storebag::keygen(given.directory, given.bits, given.ed25519Key); });
 
   CLI::App* sign = addCommand(app, "sign", "Sign a storebag in which lint finds no errors");
   sign->add_option("--key", given.sign.privateKey, "Private key in PEM form")->type_name("FILE")->required();
@@ -57,13 +60,29 @@ void describeKeys(CLI::App& app, Arguments& given) {
   sign->add_option("-o,--output", given.sign.out, "The signed container to write")
       ->type_name("FILE")
       ->required();
+  sign->add_option("--ed25519", given.sign.ed25519,
+                   "Ed25519 private key that signs as well; repeat the option for more")
+      ->type_name("FILE")
+      ->allow_extra_args(false);
+  sign->add_option("--serial", given.sign.serial, "Write this serial into the storebag first")
+      ->type_name("N")
+      ->check(CLI::Range(std::int64_t{0}, std::int64_t{9'007'199'254'740'991}));
+  sign->add_option("--expires", given.sign.expires,
+                   "Write this date (2026-12-31) or date and time (RFC 3339) into it")
+      ->type_name("DATE");
+  sign->add_option("--name", given.sign.name, "Write the name that it is served under into it")
+      ->type_name("NAME");
   sign->add_flag("--force", given.sign.force, "Sign it in spite of errors");
   sign->callback([&given] { given.outcome = storebag::sign(given.sign); });
 
   CLI::App* verify = addCommand(app, "verify", "Verify a signed storebag as the daemon does");
   verify->add_option("--key", given.key, "Public key in DER form")->type_name("FILE")->required();
+  verify
+      ->add_option("--ed25519", given.ed25519,
+                   "Public key whose Ed25519 signature must be there, too, in DER or PEM form")
+      ->type_name("FILE");
   verify->add_option("FILE", given.file, "The container")->required();
-  verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file); });
+  verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
 
   CLI::App* publish = addCommand(
       app, "publish", "Put signed storebags where a web server serves them, each under its file's name");
@@ -108,20 +127,36 @@ void describeWriting(CLI::App& app, Arguments& given) {
   schema->callback([&given] { given.outcome = storebag::schema(); });
 }
 
-void addSession(CLI::App& command, Arguments& given) {
-  Given& session = given.explain.given;
+// An option whose value `take` reads; it returns what is wrong with the value.
+template <typename Value, typename Take>
+CLI::Option* addTaken(CLI::App& command, const std::string& name, const std::string& help, Take take) {
+  return command.add_option_function<Value>(
+      name,
+      [name, take](const Value& value) {
+        if (const std::optional<std::string> fault = take(value)) throw CLI::ValidationError(name, *fault);
+      },
+      help);
+}
+
+// The same for one that may be repeated.
+template <typename Take>
+CLI::Option* addEach(CLI::App& command, const std::string& name, const std::string& help, Take take) {
+  const auto takeAll = [take](const std::vector<std::string>& values) {
+    std::optional<std::string> fault;
+    for (std::size_t i = 0; i < values.size() && !fault; ++i) fault = take(values[i]);
+    return fault;
+  };
+  return addTaken<std::vector<std::string>>(command, name, help, takeAll)->allow_extra_args(false);
+}
+
+void addSession(CLI::App& command, PlayedSession& played) {
+  Given& session = played.given;
   command.add_option("--client-type", session.clientType, "Kind of client, which selects the storebag")
       ->type_name("N")
       ->check(CLI::Range(0, 17));
-  command
-      .add_option_function<std::string>(
-          "--environment",
-          [&session](const std::string& name) {
-            const auto environment = environmentNamed(name);
-            if (!environment) throw CLI::ValidationError("--environment", environment.error());
-            session.environment = environment.value();
-          },
-          "Environment of the device, as its section is named [release]")
+  addTaken<std::string>(command, "--environment",
+                        "Environment of the device, as its section is named [release]",
+                        [&session](const std::string& name) { return session.takeEnvironment(name); })
       ->type_name("NAME");
   for (const auto& [option, key] : {std::pair("--client", wire::kVeltraUserInfoClientName),
                                     std::pair("--service", wire::kVeltraUserInfoServiceName)})
@@ -130,10 +165,9 @@ void addSession(CLI::App& command, Arguments& given) {
             option, [&session, key = key](const std::string& name) { session.setUserInfo(key, name); },
             std::string("User info \"") + key + "\"")
         ->type_name("NAME");
-  command
-      .add_option("--user-info", given.explain.userInfo, "More user info; repeat the option for each entry")
-      ->type_name("KEY=VALUE")
-      ->allow_extra_args(false);
+  addEach(command, "--user-info", "More user info; repeat the option for each entry",
+          [&session](const std::string& text) { return session.takeUserInfo(text); })
+      ->type_name("KEY=VALUE");
   command.add_option("--session-id", session.sessionID, "The client's number for this session")
       ->type_name("N");
   command.add_option("--client-version", session.clientVersion, "The client's version")->type_name("N");
@@ -141,9 +175,10 @@ void addSession(CLI::App& command, Arguments& given) {
   command.add_flag("--batch-events", session.batchEvents, "Let back ends collect events");
 }
 
-void addDevice(CLI::App& command, Arguments& given) {
-  Given& session = given.explain.given;
-  command.add_option("--country", session.country, "Country of the locale; without it there is none")
+void addDevice(CLI::App& command, PlayedSession& played) {
+  Given& session = played.given;
+  addTaken<std::string>(command, "--country", "Country of the locale; without it there is none",
+                        [&session](const std::string& code) { return session.takeCountry(code); })
       ->type_name("CODE");
   command
       .add_option_function<std::string>(
@@ -151,23 +186,24 @@ void addDevice(CLI::App& command, Arguments& given) {
           "Whether the user has consented: yes or no [yes]")
       ->type_name("WORD")
       ->check(CLI::IsMember({"yes", "no"}));
-  command
-      .add_option("--device", given.explain.device, "Properties of the device, with the keys of device.plist")
+  command.add_option("--device", played.device, "Properties of the device, with the keys of device.plist")
       ->type_name("FILE");
-  command.add_option("--policy", given.explain.policy, "Limits of the owner, as in policy.json")
-      ->type_name("FILE");
+  command.add_option("--policy", played.policy, "Limits of the owner, as in policy.json")->type_name("FILE");
+  addEach(command, "--draw",
+          "Sampling factor of all back ends, or NAME=X of one; may be repeated [sampled in]",
+          [&session](const std::string& text) { return session.takeDraw(text); })
+      ->type_name("X");
   command
-      .add_option("--draw", given.explain.draws,
-                  "Sampling factor of all back ends, or NAME=X of one; may be repeated [sampled in]")
-      ->type_name("X")
-      ->allow_extra_args(false);
+      .add_option("--messages", played.messages,
+                  "Messages as veltractl watch --json --contents and veltractl session have them")
+      ->type_name("FILE");
 }
 
 void describePlaying(CLI::App& app, Arguments& given) {
   CLI::App* explain = addCommand(app, "explain", "Show what a storebag does with messages of a session");
   explain->add_option("FILE", given.explain.file, "A container or an unsigned storebag")->required();
-  addSession(*explain, given);
-  addDevice(*explain, given);
+  addSession(*explain, given.explain.session);
+  addDevice(*explain, given.explain.session);
   explain->add_option("--category", given.explain.category, "Category of the message")->type_name("N");
   explain->add_option("--type", given.explain.type, "Type of the message")->type_name("N");
   explain->add_option("--flag", given.explain.flag, "1: realtime, 2: overrides sampling, 3: both")
@@ -176,12 +212,17 @@ void describePlaying(CLI::App& app, Arguments& given) {
   explain->add_option("ENTRY", given.explain.payload, "Entries of the message's payload: KEY=VALUE");
   explain->add_option("--payload", given.explain.payloadFile, "The payload: one JSON object")
       ->type_name("FILE");
-  explain
-      ->add_option("--messages", given.explain.messages,
-                   "Messages as veltractl watch --json --contents and veltractl session have them")
-      ->type_name("FILE");
   explain->add_flag("--json", given.explain.json, "Print one object");
   explain->callback([&given] { given.outcome = storebag::explain(given.explain); });
+
+  CLI::App* diff = addCommand(
+      app, "diff", "Show what changes between two states of a storebag, the worst for users first");
+  diff->add_option("OLD", given.diff.before, "The storebag before, signed or not")->required();
+  diff->add_option("NEW", given.diff.now, "The storebag now, signed or not")->required();
+  addDevice(*diff, given.diff.session);
+  addSession(*diff, given.diff.session);
+  diff->add_flag("--json", given.diff.json, "Print one object");
+  diff->callback([&given] { given.outcome = storebag::diff(given.diff); });
 
   CLI::App* test = addCommand(app, "test", "Run suites of cases that say what a storebag is to do");
   test->add_option("SUITE", given.test.suites, "Suites as JSON with comments")->required();
@@ -195,7 +236,7 @@ void describePlaying(CLI::App& app, Arguments& given) {
 
 void describe(CLI::App& app, Arguments& given) {
   app.name("veltra-storebag");
-  app.description("Create signing keys; write, check, try, sign, verify and show storebags.");
+  app.description("Create signing keys; write, check, try, compare, sign, verify and show storebags.");
   tools::useManualStyle(app);
   app.set_version_flag("--version", std::string("veltra-storebag ") + kVersion, "Print the version");
   app.require_subcommand(1);

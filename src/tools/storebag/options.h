@@ -12,14 +12,16 @@
 namespace veltrad::storebag {
 
 struct Arguments {
-  std::string directory, key, file;
+  std::string directory, key, ed25519, file;
   int bits = config::SigningKey::kFewestBits;
   bool json = false;
+  bool ed25519Key = false;
   SignRequest sign;
   PublishRequest publish;
   LintRequest lint;
   FormatRequest format;
   ExplainRequest explain;
+  DiffRequest diff;
   TestRequest test;
   // Of the command, which runs while the arguments are parsed.
   Outcome outcome;

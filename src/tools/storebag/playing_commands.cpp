@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The commands that play a storebag: explain and test.
+// The commands that play storebags: explain, diff and test.
 #include <fmt/format.h>
 
 #include "formats/json.h"
@@ -7,26 +7,13 @@
 #include "storebag/commands.h"
 #include "storebag/document.h"
 #include "storebag/explanation.h"
+#include "storebag/recording.h"
+#include "storebag/storebag_diff.h"
 #include "storebag/suite.h"
 #include "tools/key_value.h"
 
 namespace veltrad::storebag {
 namespace {
-
-std::optional<std::string> readDraws(const std::vector<std::string>& texts, Given& given) {
-  for (const std::string& text : texts) {
-    const std::size_t equals = text.find('=');
-    const bool named = equals != std::string::npos;
-    const auto number = formats::parseJSON(named ? text.substr(equals + 1) : text);
-    if (!number || !number.value().isNumber())
-      return fmt::format("--draw {}: expected a number from 0 to 1, or NAME=NUMBER", text);
-    if (named)
-      given.draws[text.substr(0, equals)] = *number.value().toDouble();
-    else
-      given.draw = *number.value().toDouble();
-  }
-  return std::nullopt;
-}
 
 // The one message of the options, if they give one.
 std::optional<std::string> readMessage(const ExplainRequest& request, Given& given) {
@@ -49,38 +36,17 @@ std::optional<std::string> readMessage(const ExplainRequest& request, Given& giv
   return std::nullopt;
 }
 
-std::optional<std::string> readFiles(const ExplainRequest& request, Given& given) {
-  if (request.device) {
-    auto device = readDictionary(*request.device);
+std::optional<std::string> readFiles(const PlayedSession& session, Given& given) {
+  if (session.device) {
+    auto device = readDevice(*session.device);
     if (!device) return device.error();
     given.device = std::move(device).value();
   }
-  if (request.policy) {
-    auto policy = readDictionary(*request.policy);
-    if (!policy) return policy.error();
-    given.policy = std::move(policy).value();
-  }
-  if (!request.messages) return std::nullopt;
-  const auto lines = readBytes(*request.messages);
-  if (!lines) return lines.error();
-  auto messages = messagesIn(lines.value());
-  if (!messages) return *request.messages + ":" + messages.error();
-  given.messages = std::move(messages).value();
+  if (!session.policy) return std::nullopt;
+  auto policy = readPolicy(*session.policy);
+  if (!policy) return policy.error();
+  given.policy = std::move(policy).value();
   return std::nullopt;
-}
-
-std::optional<std::string> readUserInfo(const std::vector<std::string>& texts, Given& given) {
-  const auto entries = tools::parseKeyValues(texts);
-  if (!entries) return "--user-info " + entries.error();
-  for (const auto& [key, value] : entries.value()) given.setUserInfo(key, value);
-  return std::nullopt;
-}
-
-std::optional<std::string> complete(const ExplainRequest& request, Given& given) {
-  if (const auto wrong = readUserInfo(request.userInfo, given)) return wrong;
-  if (const auto wrong = readDraws(request.draws, given)) return wrong;
-  if (const auto wrong = readFiles(request, given)) return wrong;
-  return readMessage(request, given);
 }
 
 }  // namespace
@@ -88,10 +54,36 @@ std::optional<std::string> complete(const ExplainRequest& request, Given& given)
 Outcome explain(const ExplainRequest& request) {
   const auto bag = readStorebag(request.file);
   if (!bag) return {false, bag.error().line()};
-  Given given = request.given;
-  if (const auto wrong = complete(request, given)) return {false, *wrong};
+  Given given = request.session.given;
+  if (const auto wrong = readFiles(request.session, given)) return {false, *wrong};
+  if (request.session.messages) {
+    auto messages = readMessages(*request.session.messages);
+    if (!messages) return {false, messages.error()};
+    given.messages = std::move(messages).value();
+  }
+  if (const auto wrong = readMessage(request, given)) return {false, *wrong};
   const Explanation told = explain(bag.value().storebag, given);
   return {true, request.json ? formats::writeJSON(asDictionary(told)) + "\n" : textOf(told)};
+}
+
+Outcome diff(const DiffRequest& request) {
+  if (request.before == "-" && request.now == "-")
+    return {false, "only one of the two can be standard input"};
+  const auto before = readStorebag(request.before);
+  if (!before) return {false, before.error().line()};
+  const auto now = readStorebag(request.now);
+  if (!now) return {false, now.error().line()};
+  Given given = request.session.given;
+  if (const auto wrong = readFiles(request.session, given)) return {false, *wrong};
+  StorebagDiff found{changesOf(before.value().storebag, now.value().storebag), std::nullopt};
+  if (request.session.messages) {
+    const auto recording = readRecording(*request.session.messages);
+    if (!recording) return {false, recording.error()};
+    found.messages =
+        messageChangesOf(before.value().storebag, now.value().storebag, given, recording.value());
+  }
+  return {true, request.json ? formats::writeJSON(asDictionary(found)) + "\n" : textOf(found),
+          found.letsMoreLeave()};
 }
 
 Outcome test(const TestRequest& request) {

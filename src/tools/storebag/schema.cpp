@@ -17,11 +17,24 @@ using config::Key;
 using config::KeyTable;
 using config::KeyType;
 
-constexpr const char* kNamesPattern = R"(^[^,\s]([^,]*[^,\s])?(,[^,\s]([^,]*[^,\s])?)*$)";
-constexpr const char* kNamePattern = R"(^\S(.*\S)?$)";
-constexpr const char* kAddressPattern = R"(^[hH][tT][tT][pP][sS]://[^\s/?#@]+([/?#]\S*)?$)";
-constexpr const char* kAddressWithoutQueryPattern = R"(^[hH][tT][tT][pP][sS]://[^\s/?#@]+(/[^\s?#]*)?$)";
-constexpr const char* kIPv4Pattern = R"(^((25[0-5]|2[0-4][0-9]|1[0-9]{2}|[1-9]?[0-9])(\.(?!$)|$)){4}$)";
+// The form of a text, and what editors say of another one.
+struct Form {
+  const char* pattern;
+  const char* expected;
+};
+constexpr Form kNames{R"(^[^,\s]([^,]*[^,\s])?(,[^,\s]([^,]*[^,\s])?)*$)",
+                      "Write names with commas between them, without blanks: \"phone,lamp\"."};
+constexpr Form kName{R"(^\S(.*\S)?$)", "Write a name without blanks around it."};
+constexpr Form kAddress{R"(^[hH][tT][tT][pP][sS]://[^\s/?#@]+([/?#]\S*)?$)",
+                        "Write https://HOST/PATH, without a user's name."};
+constexpr Form kAddressWithoutQuery{R"(^[hH][tT][tT][pP][sS]://[^\s/?#@]+(/[^\s?#]*)?$)",
+                                    "Write https://HOST/PATH, without a user's name and a query."};
+constexpr Form kIPv4{R"(^((25[0-5]|2[0-4][0-9]|1[0-9]{2}|[1-9]?[0-9])(\.(?!$)|$)){4}$)",
+                     "Write an IPv4 address in decimal, like \"192.0.2.7\"."};
+
+Dictionary textOfForm(const Form& form) {
+  return {{"type", "string"}, {"pattern", form.pattern}, {"patternErrorMessage", form.expected}};
+}
 
 bool is(const Key& key, const char* name) {
   return key.name == std::string_view(name);
@@ -63,13 +76,11 @@ class Schema {
       case KeyType::text:
         return textOf(table, key);
       case KeyType::url:
-        return {{"type", "string"},
-                {"pattern",
-                 &table == &config::UploadProfile::kKeys ? kAddressWithoutQueryPattern : kAddressPattern}};
+        return textOfForm(&table == &config::UploadProfile::kKeys ? kAddressWithoutQuery : kAddress);
       case KeyType::names:
-        return {{"type", "string"}, {"pattern", kNamesPattern}};
+        return textOfForm(kNames);
       case KeyType::texts:
-        return listOf({{"type", "string"}, {"pattern", kNamePattern}}, key.need == config::Need::required);
+        return listOf(textOfForm(kName), key.need == config::Need::required);
       case KeyType::integer:
         return numberOf(key, Array{"integer", "boolean"});
       case KeyType::real:
@@ -89,8 +100,8 @@ class Schema {
   }
 
   static Dictionary textOf(const KeyTable& table, const Key& key) {
-    if (&table == &config::DashboardProfile::kKeys && is(key, "ip"))
-      return {{"type", "string"}, {"pattern", kIPv4Pattern}};
+    if (&table == &config::DashboardProfile::kKeys && is(key, "ip")) return textOfForm(kIPv4);
+    if (&table == &config::filterTag::kKeys && is(key, "key")) return textOfForm(kName);
     if (&table == &config::filterTag::kKeys && is(key, "action"))
       return {{"enum", Array{"remove", "sha256", "keep"}}};
     return {{"type", "string"}};

@@ -39,8 +39,8 @@ class Comparison {
       : _name(std::move(name)), _isThere(told != nullptr), _result(result) {
     if (told) _told = *told;
     // The rules are about the messages that are given, if any are.
-    for (std::size_t i = 0; i < _told.events.size(); ++i)
-      if (messages == 0 || _told.messageOfEvent[i] > 0) _events.push_back(&_told.events[i]);
+    for (const LeavingEvent& event : _told.events)
+      if (messages == 0 || event.message > 0) _events.push_back(&event);
   }
 
   void compare(const Spot& at, const Dictionary& expected) {
@@ -49,10 +49,11 @@ class Comparison {
       const std::string got(_isThere ? wire::entryOf(_told.reason).name : "no such back end");
       if (*reason != got) fail("reason", quoted(*reason), quoted(got));
     }
-    forEachField(expected, "present",
-                 [](const Dictionary& event, const std::string& field) { return event.contains(field); });
-    forEachField(expected, "hashed", [this](const Dictionary& event, const std::string& field) {
-      return event.contains(field) && _told.hashed.contains(field);
+    forEachField(expected, "present", [](const LeavingEvent& event, const std::string& field) {
+      return event.fields.contains(field);
+    });
+    forEachField(expected, "hashed", [](const LeavingEvent& event, const std::string& field) {
+      return event.fields.contains(field) && event.hashed.contains(field);
     });
     compareAbsent(expected);
     compareEqual(expected);
@@ -78,11 +79,11 @@ class Comparison {
     for (std::size_t i = 0; fields && i < fields->size(); ++i) {
       const std::string field = (*fields)[i].toText().value_or("");
       const auto wrong = std::find_if(_events.begin(), _events.end(),
-                                      [&](const Dictionary* event) { return !holds(*event, field); });
+                                      [&](const LeavingEvent* event) { return !holds(*event, field); });
       if (_events.empty())
         fail(what, quoted(field), quoted("no event leaves"));
       else if (wrong != _events.end())
-        fail(what, quoted(field), shownField(**wrong, field));
+        fail(what, quoted(field), shownField((*wrong)->fields, field));
     }
   }
 
@@ -90,9 +91,9 @@ class Comparison {
     const Array* fields = expected.array("absent");
     for (std::size_t i = 0; fields && i < fields->size(); ++i) {
       const std::string field = (*fields)[i].toText().value_or("");
-      for (const Dictionary& event : _told.events) {
-        if (!event.contains(field)) continue;
-        fail("absent", quoted(field), shownField(event, field));
+      for (const LeavingEvent& event : _told.events) {
+        if (!event.fields.contains(field)) continue;
+        fail("absent", quoted(field), shownField(event.fields, field));
         break;
       }
     }
@@ -104,10 +105,10 @@ class Comparison {
     for (const auto& [field, wanted] : *fields) {
       const std::string text = fmt::format("{{{}:{}}}", quoted(field), shownValue(wanted));
       if (_events.empty()) fail("equal", text, quoted("no event leaves"));
-      for (const Dictionary* event : _events) {
-        const Value* value = event->find(field);
+      for (const LeavingEvent* event : _events) {
+        const Value* value = event->fields.find(field);
         if (value && isSame(*value, wanted)) continue;
-        fail("equal", text, shownField(*event, field));
+        fail("equal", text, shownField(event->fields, field));
         break;
       }
     }
@@ -123,7 +124,7 @@ class Comparison {
   const bool _isThere;
   CaseResult& _result;
   BackendExplanation _told;
-  std::vector<const Dictionary*> _events;
+  std::vector<const LeavingEvent*> _events;
 };
 
 class Suite {

@@ -106,6 +106,8 @@ void ValueCheck::check(const Spot& at, const Key& key, const Value& value) const
       return checkTexts(at, key, *value.asArray());
     case KeyType::url:
       return checkAddress(at, key, *value.asString());
+    case KeyType::text:
+      return checkText(at, key, *value.asString());
     default:
       return;
   }
@@ -185,6 +187,20 @@ void ValueCheck::checkTexts(const Spot& at, const Key& key, const Array& texts) 
   }
 }
 
+// The name of a filtered field is compared whole, too.
+void ValueCheck::checkText(const Spot& at, const Key& key, const std::string& text) const {
+  if (key.name != std::string_view("key")) return;
+  const std::string_view bare = trimmed(text);
+  if (text.empty())
+    _sink.say(FindingName::empty_in_list, at, "\"key\" is empty, and no field has such a name",
+              "Write the name of the field, or take the filter out.");
+  else if (bare != text)
+    _sink.say(FindingName::blank_in_list, at,
+              fmt::format("\"key\" is {} with a blank, which is part of the name: the field leaves in clear",
+                          quoted(text)),
+              fmt::format("Write {}.", quoted(std::string(bare))));
+}
+
 void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& name) const {
   if (name.empty())
     return _sink.say(FindingName::empty_in_list, at, fmt::format("\"{}\" holds an empty text", key.name));
@@ -206,7 +222,7 @@ void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& na
             fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", key.name, quoted(name),
                         isThreshold ? "this threshold is never used"
                                     : "here case does not matter, in \"country\" it does"),
-            fmt::format("Write {}.", quoted(capital)));
+            fmt::format("Write {}.", quoted(std::as_const(capital))));
 }
 
 void ValueCheck::checkAddress(const Spot& at, const Key& key, const std::string& address) const {

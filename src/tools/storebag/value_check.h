@@ -26,6 +26,7 @@ class ValueCheck {
   void checkPresence(const Spot& at, const config::Key& key, const Value& value) const;
   void checkNames(const Spot& at, const config::Key& key, const std::string& text) const;
   void checkTexts(const Spot& at, const config::Key& key, const Array& texts) const;
+  void checkText(const Spot& at, const config::Key& key, const std::string& text) const;
   void checkName(const Spot& at, const config::Key& key, const std::string& name) const;
   void checkAddress(const Spot& at, const config::Key& key, const std::string& address) const;
 

@@ -29,7 +29,7 @@ class StorebagCommands : public testing::Test {
  protected:
   StorebagCommands() {
     const Outcome made = storebag::keygen(path("keys"), config::SigningKey::kFewestBits);
-    EXPECT_EQ(made.text, privateKey + "\n" + publicKey + "\n");
+    EXPECT_THAT(made.text, testing::StartsWith(privateKey + "\n" + publicKey + "\nSHA-256 "));
   }
   std::string path(const std::string& name) const { return _directory.path(name); }
   std::string file(const std::string& name, const std::string& bytes) const {
@@ -134,6 +134,34 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
   EXPECT_GE(time(), secondTime + std::chrono::seconds(1));
   EXPECT_THAT(refusal(storebag::rollback({"quindle"}, path("served"))),
               HasSubstr("nothing was published before"));
+}
+
+TEST_F(StorebagCommands, SignWritesWhatARolloutNeedsAndSignsTwice) {
+  const Outcome made = storebag::keygen(path("keys"), 0, true);
+  const std::string second = path("keys/ed25519.pem"), secondPublic = path("keys/ed25519.der");
+  EXPECT_THAT(made.text, testing::StartsWith(second + "\n" + secondPublic + "\nSHA-256 "));
+  EXPECT_THAT(refusal(storebag::keygen(path("keys"), 0, true)), HasSubstr("exists already"));
+  const std::string list = formats::writeXMLPropertyList(kStorebag), in = file("in", list), out = path("out");
+  const auto bagOf = [&] {
+    return config::decodeStorebagContainer(config::parseStorebagContainer(read("out")).value())->bag;
+  };
+  storebag::SignRequest request{privateKey, in, out, false, 7, "2026-12-31", "quindle", {second}};
+  EXPECT_TRUE(storebag::sign(request).done);
+  Dictionary stamped = kStorebag;
+  stamped.merge({{"serial", 7}, {"expires", "2026-12-31"}, {"name", "quindle"}});
+  EXPECT_EQ(config::parseStorebagBag(bagOf()), stamped);
+  EXPECT_THAT(storebag::verify(publicKey, out, secondPublic).text,
+              testing::AllOf(HasSubstr("the signature holds"),
+                             HasSubstr(made.text.substr(made.text.find("256 ") + 4))));
+  EXPECT_THAT(refusal(storebag::verify(publicKey, out, publicKey)), HasSubstr("an Ed25519 public key"));
+  request.expires = "tomorrow";
+  EXPECT_THAT(refusal(storebag::sign(request)), HasSubstr("--expires tomorrow: expected a date"));
+  request = {privateKey, in, out, false, {}, {}, {}, {privateKey}};
+  EXPECT_THAT(refusal(storebag::sign(request)), HasSubstr("an Ed25519 private key in PEM"));
+  request.ed25519.clear();
+  EXPECT_TRUE(storebag::sign(request).done);
+  EXPECT_EQ(bagOf(), list);  // to the byte
+  EXPECT_THAT(refusal(storebag::verify(publicKey, out, secondPublic)), HasSubstr("no Ed25519 signature"));
 }
 
 }  // namespace

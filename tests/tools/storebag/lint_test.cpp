@@ -72,6 +72,8 @@ const Mistake kMistakes[] = {
     // What people do.
     {"\"sampling_threshold\": 0.5", "¶\"sampling_treshold\": 0.5", "unknown-key", "\"sampling_threshold\""},
     {"\"release\": {", "¶\"relase\": {", "unknown-section", "\"release\""},
+    {"\"refresh_cycle\": 60,", "\"refresh_cycle\": 60, ¶\"ampery\": {},", "unknown-section",
+     "\"release\": {\"ampery\""},
     {"\"httppost\": {", "¶\"httpspost\": {", "unknown-backend", "\"httppost\""},
     {"\"uploadserver\": {", "¶\"pigeon\": {", "unknown-backend", "dashboard, uploadserver"},
     {"[\"US\", \"CA\"]", "\"US\"", "wrong-type", "[\"US\"]"},
@@ -86,6 +88,7 @@ const Mistake kMistakes[] = {
     {"\"phone,lamp\"", "\"phone, lamp\"", "blank-in-list", "\"lamp\""},
     {"[\"US\", \"CA\"]", "[\"US CA\"]", "blank-in-list", "quotes of its own"},
     {"\"phone,lamp\"", "\"phone,,lamp\"", "empty-in-list", "comma"},
+    {"\"key\": \"peer\"", "¶\"key\": \"peer \"", "blank-in-list", "\"peer\""},
     {"\"https://c.example:8443/e?x=@\"", "\"https://\"", "bad-address", "https://HOST/PATH"},
     {"\"https://c.example:8443/e?x=@\"", "\"https://c.example/a b\"", "bad-address", "%20"},
     {"\"https://c.example:8443/e?x=@\"", "\"https://c.example:99999/\"", "bad-address", "65535"},
@@ -114,15 +117,46 @@ const Mistake kMistakes[] = {
     {"\"version\": \"1\"", "\"version\": \"1\", ¶\"serial\": 4", "sha1-alone", "ed25519"},
 };
 
+// What may be mistaken for a mistake.
+const std::pair<const char*, const char*> kRight[] = {
+    {"", ""},
+    {"\"phone,lamp\"", "\"Zürich,PHONE,lamp\", \"service\": \"a b,-\""},
+    {"\"refresh_cycle\": 60", "\"refresh_cycle\": 0"},
+    {"\"sampling_threshold\": 0.5,", ""},
+    {"\"sampling_threshold\": 0.5",
+     "\"sampling_threshold\": 0, \"override_sampling\": 1, \"override_dnu\": 0"},
+    {"\"threshold\": 1}]", "\"threshold\": 0}, {\"country\": [\"MX\", \"419\"], \"threshold\": 0.25}]"},
+    {"\"action\": \"remove\"}",
+     "\"action\": \"sha256\", \"method\": 5}, {\"key\": \"peer\", \"action\": \"remove\"}"},
+    {"\"action\": \"remove\"}", "\"action\": \"keep\", \"method\": 5, \"status\": 0}"},
+    {"https://c.example:8443/e?x=@", "HTTPS://192.0.2.7/a%20b/é#x"},
+    {"{\n          \"client\": \"clock\"", "{\n          \"client\": \"phone,clock\""},
+    {"\"client\": \"clock\", \"service\"", "\"service\""},
+    {"\"uploadserver\": {",
+     "\"ampery\": {}, \"mivo\": {\"active\": true}, \"uploadserver\": {\"display_url\": \"any\", "},
+    {"\"version\": \"1\"", "\"name\": \"quindle\", \"version\": \"1\""},
+};
+
+std::string edited(const char* what, const char* by) {
+  std::string text = kGood;
+  const std::size_t at = text.find(what);
+  if (at == std::string::npos) ADD_FAILURE() << what;
+  return at == std::string::npos ? text : text.replace(at, std::string(what).size(), by);
+}
+
+TEST(Lint, FindsNothingInWhatIsRight) {
+  for (const auto& [what, by] : kRight) {
+    const auto findings = lintStorebag(bagOf(edited(what, by)));
+    EXPECT_TRUE(findings.empty()) << by << "\n" << summaryOf(findings);
+  }
+}
+
 TEST(Lint, FindsEachMistakeWithItsPlaceAndMend) {
-  EXPECT_TRUE(lintStorebag(bagOf(kGood)).empty());
   std::set<std::string> found{"syntax", "dashboard-address", "reports-without-consent"};  // see below
   for (const Mistake& mistake : kMistakes) {
     SCOPED_TRACE(fmt::format("{}: {}", mistake.name, mistake.wrong));
-    std::string text = kGood;
-    const std::size_t at = text.find(mistake.good);
-    ASSERT_NE(at, std::string::npos);
-    text.replace(at, std::string(mistake.good).size(), mistake.wrong);
+    const std::size_t at = std::string_view(kGood).find(mistake.good);
+    std::string text = edited(mistake.good, mistake.wrong);
     std::size_t wrong = text.find("¶");
     if (wrong != std::string::npos) {
       text.erase(wrong, std::string("¶").size());

@@ -1,0 +1,82 @@
+// SPDX-License-Identifier: Apache-2.0
+// A change from one state of a storebag to the next, and what it means to the users of devices.
+#pragma once
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "base/value.h"
+
+namespace veltrad::storebag {
+
+// The worst for users first.
+enum class ChangeKind {
+  consent,
+  backend,
+  filter,
+  entry,
+  address,
+  country,
+  device,
+  sampling,
+  identifier,
+  order,
+  batching,
+  hierarchy,
+  refresh,
+  version
+};
+const char* nameOf(ChangeKind kind);
+
+// Whether more leaves devices than before: more events, more in clear, or to someone who got none.
+enum class Effect { more, less, other };
+const char* nameOf(Effect effect);
+
+// Where in the new storebag; of what is gone, where in the old one.
+struct ChangePlace {
+  std::optional<std::string> section;
+  std::optional<std::string> backend;
+  std::optional<std::size_t> entry;
+  // Lists as they are written.
+  std::optional<std::string> client;
+  std::optional<std::string> service;
+};
+
+struct Change {
+  ChangeKind kind;
+  Effect effect;
+  ChangePlace at;
+  // Of the storebag, or the name of a filtered field.
+  std::optional<std::string> key;
+  std::optional<Value> before;
+  std::optional<Value> now;
+  // A sentence without a full stop.
+  std::string text;
+};
+
+// What "more", "less" and "other" are together.
+Effect worstOf(const std::vector<Change>& changes);
+void sortWorstFirst(std::vector<Change>& changes);
+
+// Takes the changes of one place.
+class ChangeSink {
+ public:
+  // `changes` outlives it.
+  ChangeSink(std::vector<Change>& changes, ChangePlace at) : _changes(changes), _at(std::move(at)) {}
+
+  void say(ChangeKind kind, Effect effect, std::optional<std::string> key, std::optional<Value> before,
+           std::optional<Value> now, std::string text) {
+    _changes.push_back(
+        {kind, effect, _at, std::move(key), std::move(before), std::move(now), std::move(text)});
+  }
+  const ChangePlace& place() const { return _at; }
+
+ private:
+  std::vector<Change>& _changes;
+  const ChangePlace _at;
+};
+
+}  // namespace veltrad::storebag

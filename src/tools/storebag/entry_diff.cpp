@@ -1,0 +1,285 @@
+// SPDX-License-Identifier: Apache-2.0
+// Says of each key of a client entry what its change means.
+#include "storebag/entry_diff.h"
+
+#include <fmt/format.h>
+
+#include <algorithm>
+#include <set>
+
+#include "backends/https/client_decision.h"
+#include "base/text.h"
+#include "http/host_name.h"
+#include "storebag/clientele.h"
+#include "storebag/filter_diff.h"
+#include "storebag/words.h"
+
+namespace veltrad::storebag {
+namespace {
+
+using config::ClientEntry;
+using enum ChangeKind;
+
+Effect effectOf(bool more, bool less) {
+  return more ? Effect::more : less ? Effect::less : Effect::other;
+}
+
+std::optional<Value> writtenValue(const Dictionary& dictionary, const std::string& key) {
+  const Value* value = dictionary.find(key);
+  return value ? std::optional(*value) : std::nullopt;
+}
+
+// How a list of texts of which one must occur has changed.
+struct ListChange {
+  std::vector<std::string> added;
+  std::vector<std::string> gone;
+  // The new list accepts, or no longer accepts, something.
+  bool wider = false;
+  bool narrower = false;
+};
+
+bool isCovered(const std::string& text, const Names& by) {
+  return std::any_of(by.begin(), by.end(),
+                     [&](const std::string& other) { return text.find(other) != std::string::npos; });
+}
+
+ListChange changeOf(const config::TextList& before, const config::TextList& now) {
+  const Names old = lowered(before.texts), current = lowered(now.texts);
+  ListChange change;
+  for (const std::string& text : now.texts) {
+    if (old.contains(lowerCase(text))) continue;
+    change.added.push_back(text);
+    change.wider = change.wider || !isCovered(lowerCase(text), old);
+  }
+  for (const std::string& text : before.texts) {
+    if (current.contains(lowerCase(text))) continue;
+    change.gone.push_back(text);
+    change.narrower = change.narrower || !isCovered(lowerCase(text), current);
+  }
+  return change;
+}
+
+// Of the devices in this country, the share that reports; nothing: the country is not listed. Consent,
+// devices and filters aside.
+std::optional<double> shareIn(const ClientEntry& entry, const std::string& country) {
+  ClientEntry open = entry;
+  open.deviceWhitelist = {};
+  open.deviceBlacklist = {};
+  open.filters.emplace();
+  const auto verdict = backends::decideOnClient(open, {true, country, "", std::nullopt, 0});
+  if (!verdict.samplingReached) return std::nullopt;
+  return std::clamp(verdict.threshold.value_or(0), 0.0, 1.0);
+}
+
+// The countries with thresholds of their own. The country of a locale has capital letters.
+std::set<std::string> countriesWithThreshold(const ClientEntry& entry) {
+  std::set<std::string> countries;
+  if (!entry.perCountrySamplingThresholds) return countries;
+  for (const config::CountryThreshold& row : *entry.perCountrySamplingThresholds)
+    for (const std::string& country : row.country.texts)
+      if (std::none_of(country.begin(), country.end(), [](char c) { return c >= 'a' && c <= 'z'; }))
+        countries.insert(country);
+  return countries;
+}
+
+std::string shareText(double share) {
+  return share >= 1 ? "all" : share <= 0 ? "none" : fmt::format("{:.6g} %", share * 100);
+}
+
+// "reported by 10 % of devices, now by all"
+std::string sharesText(double before, double now) {
+  const std::string devices = before >= 1   ? "all devices"
+                              : before <= 0 ? "no device"
+                                            : shareText(before) + " of devices";
+  return fmt::format("reported by {}, now by {}", devices, shareText(now));
+}
+
+std::string placesText(const std::vector<std::string>& countries) {
+  return countries.empty() ? "" : ", in " + listedWithAnd(countries);
+}
+
+// 0: as the session says.
+int batchingOf(const ClientEntry& entry) {
+  return !entry.expedite ? 0 : *entry.expedite == 0 ? 1 : 2;
+}
+
+}  // namespace
+
+std::string whoIn(const ClientEntry& entry, std::size_t number) {
+  std::string who = !entry.client.empty() ? listedWithAnd(entry.client)
+                    : number == 0         ? "every client"
+                                          : "every other client";
+  if (!entry.service.empty()) who += fmt::format(" (service {})", listed(entry.service, " or "));
+  return who;
+}
+
+std::string recipientOf(const std::optional<std::string>& address) {
+  constexpr std::string_view kScheme = "https://";
+  return address && lowerCase(*address).starts_with(kScheme) ? lowerCase(http::hostName(*address)) : "";
+}
+
+Effect effectOfAddress(const std::optional<std::string>& before, const std::optional<std::string>& now) {
+  const std::string old = recipientOf(before), current = recipientOf(now);
+  return effectOf(!current.empty() && current != old, current.empty() && !old.empty());
+}
+
+void EntryDiff::compare() {
+  compareConsent();
+  compareCountries();
+  compareDevices();
+  compareFilters();
+  compareSampling();
+  compareIdentifiers();
+  compareAddresses();
+  compareBatching();
+}
+
+void EntryDiff::say(ChangeKind kind, Effect effect, const char* key, std::string text) {
+  _changes.say(kind, effect, key, writtenValue(_oldGiven, key), writtenValue(_nowGiven, key),
+               std::move(text));
+}
+
+void EntryDiff::compareConsent() {
+  const bool before = _old.overrideDNU == 1, now = _now.overrideDNU == 1;
+  if (before == now) return;
+  say(consent, effectOf(now, before), "override_dnu",
+      _who + (now ? ": now reported without the user's consent, too"
+                  : ": no longer reported without the user's consent"));
+}
+
+void EntryDiff::compareCountries() {
+  const ListChange change = changeOf(_old.localeWhitelist, _now.localeWhitelist);
+  if (!change.wider && !change.narrower) return;
+  std::vector<std::string> parts;
+  if (!change.added.empty()) parts.push_back("also in " + listedWithAnd(change.added));
+  if (!change.gone.empty()) parts.push_back("no longer in " + listedWithAnd(change.gone));
+  const auto& before = _old.localeWhitelist.texts;
+  say(country, effectOf(change.wider, change.narrower), "locale_whitelist",
+      fmt::format("{}: reported in {}, now {}", _who, before.empty() ? "no country" : listedWithAnd(before),
+                  listed(parts)));
+}
+
+void EntryDiff::compareDevices() {
+  const ListChange accepted = changeOf(_old.deviceWhitelist, _now.deviceWhitelist);
+  if (accepted.wider || accepted.narrower) {
+    const auto& before = _old.deviceWhitelist.texts;
+    const auto& now = _now.deviceWhitelist.texts;
+    const bool more = !before.empty() && (now.empty() || accepted.wider);
+    const bool less = !now.empty() && (before.empty() || accepted.narrower);
+    const auto shown = [](const std::vector<std::string>& families) {
+      return families.empty() ? "every product family" : "product family " + listed(families, " or ");
+    };
+    say(device, effectOf(more, less), "device_whitelist",
+        fmt::format("{}: reported by devices of {}, now by those of {}", _who, shown(before), shown(now)));
+  }
+  const ListChange refused = changeOf(_old.deviceBlacklist, _now.deviceBlacklist);
+  if (!refused.wider && !refused.narrower) return;
+  std::vector<std::string> parts;
+  if (!refused.gone.empty()) parts.push_back("no longer refused on hardware " + listedWithAnd(refused.gone));
+  if (!refused.added.empty()) parts.push_back("now refused on hardware " + listedWithAnd(refused.added));
+  say(device, effectOf(refused.narrower, refused.wider), "device_blacklist",
+      fmt::format("{}: {}", _who, listed(parts)));
+}
+
+void EntryDiff::compareFilters() {
+  if (_old.filters.has_value() != _now.filters.has_value())
+    return say(filter, effectOf(_now.filters.has_value(), _old.filters.has_value()), "filters",
+               _who + (_now.filters ? ": nothing was reported without \"filters\", which are there now"
+                                    : ": nothing is reported any more, because \"filters\" are missing"));
+  if (!_old.filters) return;
+  for (const FieldChange& field : changedFields(*_old.filters, *_now.filters))
+    _changes.say(filter, field.effect, field.name, field.before, field.now,
+                 fmt::format("field {} {} for {}{}", field.name, field.phrase, _who, field.events));
+}
+
+void EntryDiff::compareSampling() {
+  const std::set<std::string> old = countriesWithThreshold(_old), now = countriesWithThreshold(_now);
+  std::vector<std::string> own;
+  std::set_union(old.begin(), old.end(), now.begin(), now.end(), std::back_inserter(own));
+  const double before = std::clamp(_old.samplingThreshold.value_or(0), 0.0, 1.0);
+  const double after = std::clamp(_now.samplingThreshold.value_or(0), 0.0, 1.0);
+  if (before != after) {
+    std::vector<std::string> countries;
+    for (const std::string& listedCountry : _now.localeWhitelist.texts)
+      if (!old.contains(listedCountry) || !now.contains(listedCountry)) countries.push_back(listedCountry);
+    const bool counts = !countries.empty() || _now.localeWhitelist.texts.empty();
+    say(sampling, effectOf(counts && after > before, counts && after < before), "sampling_threshold",
+        fmt::format("{}: {}{}", _who, sharesText(before, after), placesText(countries)));
+  }
+  compareCountryThresholds(own);
+  compareHeld();
+}
+
+// Those of single countries, where they do not follow from the others.
+void EntryDiff::compareCountryThresholds(const std::vector<std::string>& countries) {
+  const std::set<std::string> old = countriesWithThreshold(_old), now = countriesWithThreshold(_now);
+  for (const std::string& one : countries) {
+    const auto before = shareIn(_old, one), after = shareIn(_now, one);
+    if (!before || !after || *before == *after) continue;
+    _changes.say(sampling, effectOf(*after > *before, *after < *before), "per_country_sampling_thresholds",
+                 Value(*before), Value(*after),
+                 fmt::format("{}: {}, in {}", _who, sharesText(*before, *after), one));
+  }
+}
+
+// Events of devices that are sampled out leave if one of them overrides sampling.
+void EntryDiff::compareHeld() {
+  const double before = std::clamp(_old.overrideSampling.value_or(1), 0.0, 1.0);
+  const double now = std::clamp(_now.overrideSampling.value_or(1), 0.0, 1.0);
+  if (before == now) return;
+  const bool counts = _old.samplingThreshold.value_or(0) < 1 || _now.samplingThreshold.value_or(0) < 1;
+  say(sampling, effectOf(counts && now > before, counts && now < before), "override_sampling",
+      fmt::format("{}: a message that overrides sampling is reported by {} of the devices, now by {}", _who,
+                  shareText(before), shareText(now)));
+}
+
+void EntryDiff::compareIdentifiers() {
+  const bool oldExtras = _old.extrasOnInternal != 0, extras = _now.extrasOnInternal != 0;
+  if (oldExtras != extras)
+    say(identifier, effectOf(extras, oldExtras), "extras_on_internal",
+        _who + (extras ? ": internal builds now bear the device's own identifier"
+                       : ": internal builds no longer bear the device's own identifier"));
+  if (_old.customClientID != _now.customClientID)
+    say(identifier, effectOf(_old.customClientID, _now.customClientID), "custom_clientId",
+        _who + (_now.customClientID
+                    ? ": events now bear an identifier of the client alone, not that of the installation"
+                    : ": events now bear the identifier that all clients of the installation share"));
+  if (_old.hierarchy != _now.hierarchy)
+    say(hierarchy, Effect::other, "hierarchy",
+        fmt::format("{}: level {} of its family, now {}", _who, _old.hierarchy, _now.hierarchy));
+}
+
+void EntryDiff::compareAddresses() {
+  const auto compareOne = [this](const char* key, const char* events, const auto& before, const auto& now) {
+    const std::string old = recipientOf(before), current = recipientOf(now);
+    std::string text = fmt::format("{} of {} ", events, _who);
+    if (current.empty())
+      text += "can no longer be posted";
+    else if (old.empty())
+      text += fmt::format("go to {}; before, they could not be posted", current);
+    else if (old != current)
+      text += fmt::format("go to another host: {}, no longer {}", current, old);
+    else
+      text += fmt::format("go to {}, no longer to {}", *now, *before);
+    say(address, effectOfAddress(before, now), key, std::move(text));
+  };
+  if (_old.postURL != _now.postURL) compareOne("post_url", "events", _old.postURL, _now.postURL);
+  if (_old.realtimePostURL == _now.realtimePostURL) return;
+  const auto& before = _old.realtimePostURL ? _old.realtimePostURL : _old.postURL;
+  const auto& now = _now.realtimePostURL ? _now.realtimePostURL : _now.postURL;
+  if (before != now) compareOne("realtime_post_url", "realtime events", before, now);
+}
+
+void EntryDiff::compareBatching() {
+  static constexpr const char* kTexts[] = {"as the session says", "in batches", "each at once"};
+  const int before = batchingOf(_old), now = batchingOf(_now);
+  if (before != now)
+    say(batching, Effect::other, "expedite",
+        fmt::format("{}: events leave {}, before {}", _who, kTexts[now], kTexts[before]));
+  if (_old.eventThreshold != _now.eventThreshold)
+    say(batching, Effect::other, "event_threshold",
+        fmt::format("{}: a batch leaves above {} events of a method, now above {}", _who, _old.eventThreshold,
+                    _now.eventThreshold));
+}
+
+}  // namespace veltrad::storebag

@@ -1,0 +1,31 @@
+// SPDX-License-Identifier: Apache-2.0
+// Compares what the filters of two entries do to each field.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "base/value.h"
+#include "config/client_entry.h"
+#include "storebag/change.h"
+
+namespace veltrad::storebag {
+
+// What changes for a field, in the events in which it changes for the worst.
+struct FieldChange {
+  // As it is written.
+  std::string name;
+  Effect effect;
+  // "remove", "sha256" or "keep"; nothing: no filter decides.
+  std::optional<Value> before;
+  std::optional<Value> now;
+  // "is no longer hashed"
+  std::string phrase;
+  // Which events: " in events of method 5"; empty: all.
+  std::string events;
+};
+
+std::vector<FieldChange> changedFields(const config::Filters& before, const config::Filters& now);
+
+}  // namespace veltrad::storebag
