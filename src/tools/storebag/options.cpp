@@ -86,6 +86,7 @@ void describeKeys(CLI::App& app, Arguments& given) {
 
   CLI::App* publish = addCommand(
       app, "publish", "Put signed storebags where a web server serves them, each under its file's name");
+  publish->positionals_at_end();  // the last one is DIR
   publish->add_option("FILE", given.publish.files, "Signed containers")->required();
   publish->add_option("DIR", given.publish.directory, "The folder that is served")->required();
   publish->add_option("--key", given.publish.publicKey, "Public key in DER form that devices have")
@@ -94,6 +95,7 @@ void describeKeys(CLI::App& app, Arguments& given) {
   publish->callback([&given] { given.outcome = storebag::publish(given.publish); });
 
   CLI::App* rollback = addCommand(app, "rollback", "Serve again what was published before");
+  rollback->positionals_at_end();
   rollback->add_option("NAME", given.publish.files, "Names of storebags")->required();
   rollback->add_option("DIR", given.publish.directory, "The folder that is served")->required();
   rollback->callback(
