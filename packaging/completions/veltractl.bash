@@ -6,7 +6,7 @@ _veltractl() {
       --root | --input | --client-type | --session-id | --client-version | --client | --service | --user-info | --category | --type | --flag | --expect | --message | --backend | --last | -o | --output | --html) ((i++)) ; continue ;;
     esac
     case $path+${COMP_WORDS[i]} in
-      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +why | +watch | +config | /config+get | /config+set | /config+unset | +refresh | +report | +doctor | +stats | +privacy | /privacy+off | /privacy+on | /privacy+reset-identifiers | +history | /history+show | /history+purge) path+=/${COMP_WORDS[i]} ;;
+      +session | +send | +one-shot | +states | +display-url | +upload | +upload-log-data | +status | +metrics | +why | +watch | +config | /config+get | /config+set | /config+unset | +refresh | +report | +spool | /spool+list | /spool+send | /spool+drop | +doctor | +stats | +privacy | /privacy+off | /privacy+on | /privacy+reset-identifiers | +history | /history+show | /history+purge) path+=/${COMP_WORDS[i]} ;;
       *+-*) ;;
       *) ((given++)) ;;
     esac
@@ -35,6 +35,10 @@ _veltractl() {
     "/config") words=" get set unset" ;;
     "/refresh") words="" ;;
     "/report") words=" -o --output --yes" ;;
+    "/spool/list") words="" ;;
+    "/spool/send") words="" ;;
+    "/spool/drop") words="" ;;
+    "/spool") words=" list send drop" ;;
     "/doctor") words=" --client-type" ;;
     "/stats") words="" ;;
     "/privacy/off") words="" ;;
@@ -44,7 +48,7 @@ _veltractl() {
     "/history/show") words=" --raw" ;;
     "/history/purge") words="" ;;
     "/history") words=" --html show purge" ;;
-    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics why watch config refresh report doctor stats privacy history" ;;
+    "") words=" --root --json --version -h --help session send one-shot states display-url upload upload-log-data status metrics why watch config refresh report spool doctor stats privacy history" ;;
   esac
   [[ $path == "" ]] || words+=" --root --json --version -h --help"
   if [[ $current != -* ]]; then

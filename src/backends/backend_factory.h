@@ -30,7 +30,7 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 18 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
+// Its 19 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
 // needs. All of it outlives the back ends.
 struct BackendServices {
   http::HTTPClient& http;
@@ -55,6 +55,8 @@ struct BackendServices {
   config::OwnerGate* gate = nullptr;
   // Null: what becomes of messages is not recorded.
   platform::FateRing* fates = nullptr;
+  // Null: posts that fail are lost.
+  PostSpool* spool = nullptr;
 };
 
 // A back end's section of a storebag. Null for a back end that reads no section.
@@ -64,7 +66,7 @@ class BackendFactory {
  public:
   explicit BackendFactory(BackendServices services)
       : _services(services),
-        _posts(services.http, services.clock, services.counters, services.choices),
+        _posts(services.http, services.clock, services.counters, services.choices, services.spool),
         _logData(services.http, services.counters) {}
   // Returns a back end that has these facts. Null, after one log line, if the name is unknown or the profile
   // is not sufficient. `oneShot`: the back end serves a single message instead of a session. `draw`: its

@@ -2,11 +2,16 @@
 // Names a session's client.
 #include "backends/session_facts.h"
 
+#include <functional>
 #include <limits>
 
 #include "wire/constants.h"
 
 namespace veltrad::backends {
+
+std::uint32_t connectionNumber(std::string_view sessionIDString) {
+  return static_cast<std::uint32_t>(std::hash<std::string_view>()(sessionIDString));
+}
 
 SharedDictionary clientOf(const SessionFacts& facts) {
   const auto textOrNull = [&facts](const char* key) {

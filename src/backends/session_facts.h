@@ -7,6 +7,7 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 #include "base/value.h"
 #include "config/field_changes.h"
@@ -52,6 +53,8 @@ struct SessionFacts {
   DeviceFacts device;
   SelfVersion selfVersion;
   std::uint32_t sessionID = 0;
+  // Another one for each connection; 0: not known.
+  std::uint32_t connection = 0;
   // The client type.
   std::int32_t compType = 0;
   std::uint16_t clientVersion = 0;
@@ -82,6 +85,8 @@ struct SessionFacts {
 };
 using SharedFacts = std::shared_ptr<const SessionFacts>;
 
+// `sessionIDString`: 16 random bytes as a text.
+std::uint32_t connectionNumber(std::string_view sessionIDString);
 // {"clientType", "sessionID", "client", "service"}; names that may not leave are not among them.
 SharedDictionary clientOf(const SessionFacts& facts);
 // What else the history of what left says of it: {"backend", "storebag", "entry", "removed", "hashed"}.

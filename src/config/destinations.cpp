@@ -13,7 +13,7 @@ namespace veltrad::config {
 namespace {
 
 constexpr std::size_t kLargestDestinationsFile = 4u << 20;
-constexpr std::int64_t kSecondsOfHour = 3'600;
+constexpr std::int64_t kSecondsOfAnHour = 3'600;
 constexpr std::int64_t kHours = 24;
 
 // "https://a.example:8443/x" → "https://a.example:8443"
@@ -25,7 +25,7 @@ std::string_view addressOf(std::string_view url) {
 }  // namespace
 
 std::int64_t Destinations::hour() const {
-  return _clock.now().seconds / kSecondsOfHour;
+  return _clock.now().seconds / kSecondsOfAnHour;
 }
 
 void Destinations::forgetOld() {

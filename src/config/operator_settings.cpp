@@ -19,9 +19,6 @@ constexpr Key later(const char* name, KeyType type, Range range, const char* byD
   key.choices = choices;
   return key;
 }
-constexpr Key later(const char* name, const KeyTable& inner, const char* byDefault, const char* meaning) {
-  return {name, dictionary, kUnbounded, optional, byDefault, meaning, &inner};
-}
 
 template <auto Member>
 constexpr Key chosen(const char* name, const char* choices, const char* byDefault, const char* meaning) {
@@ -31,9 +28,7 @@ constexpr Key chosen(const char* name, const char* choices, const char* byDefaul
 }
 
 constexpr double kMostBytes = 1e15;
-constexpr Range kBytes{1, kMostBytes};
-constexpr Range kDays{1, 36'500};
-constexpr Range kSeconds{1, 31'536'000};
+constexpr Range kWait{0.05, 86'400};
 
 constexpr std::array kStorebagChoiceKeys{
     row<&StorebagChoices::persist>(
@@ -63,15 +58,28 @@ constexpr std::array kFatesKeys{
         .key,
 };
 
-constexpr std::array kSpoolKeys{
-    later("bytes", integer, kBytes, "no spool", "Bytes of failed posts that are kept on disk."),
-    later("days", real, kDays, "no spool", "Days for which a failed post is kept."),
-    later("perUser", integer, kBytes, "no bound", "Bytes of one user's failed posts."),
-    later("postsPerSecond", real, {0.001, 1'000}, "4", "Kept posts that are sent again in a second."),
-    later("firstWait", real, kSeconds, "30", "Seconds before a failed post is sent again."),
-    later("longestWait", real, kSeconds, "900", "Seconds that the wait grows to."),
-};
-constexpr KeyTable kSpoolTable{kSpoolKeys};
+constexpr std::array kSpoolKeys = keysOf<SpoolChoices>({
+    row<&SpoolChoices::bytes>({"bytes",
+                               integer,
+                               {1 << 20, kMostBytes},
+                               optional,
+                               "67108864",
+                               "Bytes of the files that failed posts are kept in."}),
+    row<&SpoolChoices::days>(
+        {"days", real, {1e-5, 36'500}, optional, "7", "Days for which a failed post is kept."}),
+    row<&SpoolChoices::perUser>(
+        {"perUser", real, {0.001, 1}, optional, "0.5", "Share of the bytes that one user id may take."}),
+    row<&SpoolChoices::postsPerSecond>({"postsPerSecond",
+                                        real,
+                                        {0.001, 1'000},
+                                        optional,
+                                        "4",
+                                        "Kept posts that leave for one address in a second."}),
+    row<&SpoolChoices::firstWait>({"firstWait", real, kWait, optional, "30",
+                                   "Seconds within which a failing address is tried again, at random."}),
+    row<&SpoolChoices::longestWait>({"longestWait", real, kWait, optional, "900",
+                                     "Seconds that this grows to: it doubles with each failure."}),
+});
 
 constexpr std::array kCompressionKeys{
     row<&CompressionChoices::level>(
@@ -104,7 +112,10 @@ constexpr std::array kSettingsKeys{
     row<&OperatorChoices::fates>({"fates", dictionary, kUnbounded, optional, "as its keys say",
                                   "The record of what became of messages.", &FatesChoices::kKeys})
         .key,
-    later("spool", kSpoolTable, "no spool", "Failed posts are kept on disk and sent again."),
+    row<&OperatorChoices::spool>({"spool", dictionary, kUnbounded, optional, "no spool",
+                                  "Failed posts are kept on disk and sent again. Read at start.",
+                                  &SpoolChoices::kKeys})
+        .key,
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
                                         "How event posts are compressed.", &CompressionChoices::kKeys})
         .key,
@@ -115,6 +126,7 @@ constexpr std::array kSettingsKeys{
 
 constinit const KeyTable StorebagChoices::kKeys{kStorebagChoiceKeys};
 constinit const KeyTable FatesChoices::kKeys{kFatesKeys};
+constinit const KeyTable SpoolChoices::kKeys{kSpoolKeys};
 constinit const KeyTable CompressionChoices::kKeys{kCompressionKeys};
 constinit const KeyTable OperatorChoices::kKeys{kSettingsKeys};
 
@@ -133,6 +145,10 @@ void take(const Key&, const Value& value, CompressionChoices& field) {
 void take(const Key& key, const Value& value, Chosen& field) {
   const std::string* text = value.asString();
   field.on = text && *text == key.choices;
+}
+
+void take(const Key&, const Value& value, std::optional<SpoolChoices>& field) {
+  if (const Dictionary* dictionary = value.asDictionary()) field = parsed<SpoolChoices>(*dictionary);
 }
 
 void take(const Key&, const Value& value, Sampling& field) {

@@ -4,6 +4,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 
 #include "config/key_table.h"
@@ -47,6 +48,19 @@ struct FatesChoices {
 };
 void take(const Key& key, const Value& value, FatesChoices& field);
 
+// "spool". Shares and times may be fractions.
+struct SpoolChoices {
+  std::optional<std::int64_t> bytes = 67'108'864;  // of the files
+  std::optional<double> days = 7;
+  std::optional<double> perUser = 0.5;  // of `bytes`
+  std::optional<double> postsPerSecond = 4;
+  std::optional<double> firstWait = 30;  // in seconds
+  std::optional<double> longestWait = 900;
+
+  static const KeyTable kKeys;
+};
+void take(const Key& key, const Value& value, std::optional<SpoolChoices>& field);
+
 // How a back end comes by its sampling factor.
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
@@ -59,6 +73,8 @@ struct OperatorChoices {
   TextList keys;  // files in Root::keysDirectory()
   FatesChoices fates;
   CompressionChoices compression;
+  // Nothing: posts that fail are not kept.
+  std::optional<SpoolChoices> spool;
 
   static const KeyTable kKeys;
 };

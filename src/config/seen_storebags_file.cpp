@@ -71,9 +71,10 @@ void SeenStorebagsFile::remember(const std::string& name, const StorebagClaims& 
     const auto before = read();
     if (!before) return;  // it was there a moment ago, when the bag was accepted
     config::remember(*_seen, name, claims, signers, rules);
-    if (*_seen == before.value()) return;
-    if (const auto written = _files.replace(_path, textOf(*_seen), 0600); !written)
-      failed = written.error().description;
+    if (*_seen == before.value() && _stored) return;
+    const auto written = _files.replace(_path, textOf(*_seen), 0600);
+    _stored = written.ok();
+    if (!written) failed = written.error().description;
   }
   if (failed)
     logWarning("Storebag '%s': its serial and revocations will not be known after the next start: %s",

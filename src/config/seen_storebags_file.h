@@ -31,8 +31,8 @@ class SeenStorebagsFile {
     std::string description;
   };
   Result<SeenStorebags, Failed> seen();
-  // Takes an accepted bag in, on disk before it returns. What cannot be written is one warning, and holds
-  // until the daemon ends.
+  // Takes an accepted bag in, on disk before it returns. What cannot be written is one warning, and is
+  // written with the next accepted bag.
   void remember(const std::string& name, const StorebagClaims& claims, const StorebagSigners& signers,
                 const StorebagRules& rules);
   const std::string& path() const { return _path; }
@@ -45,6 +45,7 @@ class SeenStorebagsFile {
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::optional<SeenStorebags> _seen GUARDED_BY(_mutex);  // nothing before the file could be read
+  bool _stored GUARDED_BY(_mutex) = true;                 // what was seen is on disk
 };
 
 }  // namespace veltrad::config

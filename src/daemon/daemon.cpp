@@ -2,12 +2,34 @@
 // Passes the services to the rooms.
 #include "daemon/daemon.h"
 
+#include "platform/log.h"
+#include "support/spool_folder.h"
+
 namespace veltrad::daemon {
 
 namespace {
 std::size_t bytesForFates(config::OperatorSettings& settings) {
   const auto choices = settings.current();
   return static_cast<std::size_t>((choices ? *choices : config::OperatorChoices()).fates.bytes);
+}
+
+std::optional<backends::PostSpool> spoolOf(Services& services, config::OperatorSettings& settings,
+                                           support::DeviceIdentity& device, platform::FateRing& fates) {
+  const auto choices = settings.current();
+  if (!choices || !choices->spool) return std::nullopt;
+  const config::SpoolChoices& chosen = *choices->spool;
+  return std::optional<backends::PostSpool>(
+      std::in_place,
+      backends::SpoolServices{services.clock,
+                              services.counters,
+                              services.files,
+                              services.writer,
+                              {services.gate, services.preferences, services.locale, device},
+                              &fates},
+      backends::SpoolSettings{services.root.spoolDirectory(),
+                              {static_cast<std::uint64_t>(*chosen.bytes), *chosen.perUser},
+                              *chosen.days,
+                              {*chosen.postsPerSecond, *chosen.firstWait, *chosen.longestWait}});
 }
 }  // namespace
 
@@ -19,11 +41,12 @@ Daemon::Daemon(Services& services)
       _choices(services.files, services.root.settingsPath()),
       _fates(bytesForFates(_choices), services.clock),
       _sampling(_choices, services.secret),
+      _spool(spoolOf(services, _choices, _device, _fates)),
       _messageLog(services.clock, services.root.messageLogDirectory(), services.writer, services.counters),
       _factory({services.http, services.clock, services.random, services.locale, services.preferences,
                 services.counters, services.energyLog, services.adaptorBundle, _settings, _choices, _device,
                 _library, services.pool, services.lentFiles, services.root.preferencesDirectory(), &_sampling,
-                &services.gate, &_fates}),
+                &services.gate, &_fates, spool()}),
       _storebagStore(services.files, services.clock, services.root.storebagsDirectory()),
       _seenStorebags(services.files, services.root.seenStorebagsPath()),
       _storebagTrust(_library, services.files, _seenStorebags, services.clock, services.counters,
@@ -34,7 +57,33 @@ Daemon::Daemon(Services& services)
               services.counters, _flushes, _messageLog, services.gate, &_fates},
              _storebags, services.transaction),
       _follower(_agent, _choices),
-      _privacy(services, _agent, _factory, _library) {}
+      _privacy(services, _agent, _factory, _library, spool()) {}
+
+void Daemon::startSpool() {
+  if (_spool) {
+    if (const auto made = _spool->folder().make(); !made)
+      logError("The spool's directory cannot be made: %s", made.error().c_str());
+    _spoolSender.emplace(*_spool, _services.http);
+    if (!_spoolSender->start(_agent.storebags()))
+      logError("The spool's thread cannot be started, and nothing of it is sent");
+    return;
+  }
+  // What the settings say is not known while they cannot be read.
+  const auto choices = _choices.current();
+  if (!choices || choices->spool) return;
+  const support::SpoolFolder folder(_services.files, _services.root.spoolDirectory());
+  const auto removed = folder.removeAll();
+  _services.counters.eventTaken(removed.events);
+  _services.counters.count(wire::Reason::by_hand, removed.events);
+  _services.counters.count(wire::Reason::spool_torn, removed.torn);
+  if (removed.posts + removed.torn > 0)
+    logWarning("There is no \"spool\" in the settings: %llu kept posts are removed",
+               static_cast<unsigned long long>(removed.posts + removed.torn));
+}
+
+void Daemon::stopSpool() {
+  if (_spoolSender) _spoolSender->stop();
+}
 
 void Daemon::readConfigurationAgain() {
   _services.entitlements.readAgain();

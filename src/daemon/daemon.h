@@ -2,7 +2,11 @@
 // Connects the daemon's rooms. Main thread.
 #pragma once
 
+#include <optional>
+
 #include "backends/backend_factory.h"
+#include "backends/https/post_spool.h"
+#include "backends/https/spool_sender.h"
 #include "backends/sampling_factors.h"
 #include "config/operator_settings.h"
 #include "config/process_settings.h"
@@ -23,7 +27,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 18 fields are these objects, in the order in which they need each other, whatever the padding.
+// 19 fields are these objects, in the order in which they need each other, whatever the padding.
 // NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding)
 class Daemon {
  public:
@@ -37,6 +41,13 @@ class Daemon {
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
   platform::FateRing& fates() { return _fates; }
+  // Null: posts that fail are lost.
+  backends::PostSpool* spool() { return _spool ? &*_spool : nullptr; }
+  // Sends what an earlier daemon has kept, and what this one keeps, or removes it where the operator wants no
+  // spool any more.
+  void startSpool();
+  // From now on nothing of the spool is sent.
+  void stopSpool();
 
  private:
   Services& _services;
@@ -46,6 +57,7 @@ class Daemon {
   config::OperatorSettings _choices;
   platform::FateRing _fates;
   backends::SamplingFactors _sampling;
+  std::optional<backends::PostSpool> _spool;
   support::MessageLog _messageLog;
   session::FlushCounters _flushes;
   backends::BackendFactory _factory;
@@ -56,6 +68,7 @@ class Daemon {
   VeltradAgent _agent;
   StorebagFollower _follower;
   Privacy _privacy;
+  std::optional<backends::SpoolSender> _spoolSender;
 };
 
 }  // namespace veltrad::daemon

@@ -31,6 +31,8 @@ using namespace std::chrono_literals;
 
 // The longest time from the signal to the end of the process.
 constexpr auto kStopBound = 10s;
+// What of it is left to a spool for the posts that have no answer until then.
+constexpr std::chrono::milliseconds kTimeToKeep = 3s;
 // How often the counters are written and the watchdog is fed.
 constexpr auto kTick = 1000ms;
 // How often the owner's word is read again in that time: a change and the end of what is under way, which
@@ -159,7 +161,7 @@ platform::StateFile::State metricsState(daemon::Observers& observers) {
   const auto version = [&observers] {
     const daemon::Gauges gauges = observers.gauges();
     return platform::StateFile::Version{observers.countsTotal(), gauges.sessions, gauges.connections,
-                                        gauges.postsUnderWay};
+                                        gauges.postsUnderWay, gauges.spoolPosts};
   };
   return {"The metrics", version, [&observers] { return observers.metricsText(); }};
 }
@@ -223,18 +225,21 @@ bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& lis
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
   daemon.follower().stop();
+  daemon.stopSpool();
   std::size_t stuck = listener.invalidate(deadline - 1s);
   stuck += control.invalidate(deadline - 1s);
-  services.http.drain(deadline - 500ms);
+  services.http.drain(deadline - (daemon.spool() ? kTimeToKeep : 500ms));
+  daemon.stopSpool();  // removes what was answered meanwhile
   services.pool.drain(deadline - 300ms);
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
+  const bool kept = !daemon.spool() || daemon.spool()->drain(deadline - 300ms);
   services.history.writeNow(deadline - 250ms);
   if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
   if (services.destinations.version() > 0) files.destinations.writeLast(deadline - 150ms);
   const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
-  if (!written) logWarning("main: the disk did not take everything within the time of a stop");
-  return stuck == 0 && written;
+  if (!kept || !written) logWarning("main: the disk did not take everything within the time of a stop");
+  return stuck == 0 && kept && written;
 }
 
 // Prints what one of the two known arguments asks for. False: there is none, and others are not read.
@@ -296,14 +301,19 @@ int main(int count, char** arguments) {
                          daemon.agent());
   daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
   daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
-                              started);
+                              daemon.spool(), started);
   ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
                          services.counters, services.observersMemory, services.root.entitlementsPath(),
                          kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
                         observers);
   platform::StateFile metricsFile(metricsState(observers), services.files, services.writer,
                                   services.root.metricsPath());
-  if (!listener.resume() || !control.resume()) return 1;
+  daemon.startSpool();
+  if (!listener.resume() || !control.resume()) {
+    daemon.stopSpool();
+    services.http.drain(std::chrono::steady_clock::now());
+    return 1;
+  }
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");

@@ -49,6 +49,8 @@ std::string metricsText(const platform::Counters& counters, const Gauges& gauges
   gauge(out, "veltrad_sessions", gauges.sessions, "Sessions that are open.");
   gauge(out, "veltrad_connections", gauges.connections, "Connections of clients that are open.");
   gauge(out, "veltrad_posts_under_way", gauges.postsUnderWay, "Event posts without an answer yet.");
+  gauge(out, "veltrad_spool_posts", gauges.spoolPosts, "Posts that failed and are kept to be sent again.");
+  gauge(out, "veltrad_spool_bytes", gauges.spoolBytes, "Their files.");
   gauge(out, "veltrad_charged_memory_bytes", gauges.chargedBytes, "Memory that is kept for clients.");
   gauge(out, "veltrad_resident_memory_bytes", residentBytes, "Resident memory of the process.");
   gauge(out, "veltrad_start_time_seconds", gauges.started, "When the process started, since 1970.");

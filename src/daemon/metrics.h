@@ -18,6 +18,8 @@ struct Gauges {
   std::size_t postsUnderWay = 0;
   std::uint64_t chargedBytes = 0;  // what is kept for clients
   double started = 0;              // of the process, seconds since 1970
+  std::uint64_t spoolPosts = 0;
+  std::uint64_t spoolBytes = 0;
 };
 
 // Families are "veltrad_…", each with HELP, TYPE and, where it has one, UNIT; the last line is "# EOF". Every

@@ -4,10 +4,12 @@
 
 #include <fmt/format.h>
 
+#include "backends/https/post_spool.h"
 #include "base/version.h"
 #include "daemon/doctor.h"
 #include "daemon/history_answers.h"
 #include "daemon/refresh.h"
+#include "daemon/spool_answers.h"
 #include "daemon/status.h"
 #include "daemon/veltrad_agent.h"
 #include "http/http_queue.h"
@@ -51,6 +53,9 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
       {question::kHistory, Right::control, &Observers::history},
       {question::kHistoryBody, Right::control, &Observers::historyBody},
       {question::kPurgeHistory, Right::control, &Observers::purgeHistory},
+      {question::kSpool, Right::control, &Observers::spool},
+      {question::kSendSpool, Right::control, &Observers::sendSpool},
+      {question::kDropFromSpool, Right::control, &Observers::dropFromSpool},
       {question::kDoctor, Right::observe, nullptr, &Observers::doctor},
   };
   for (const Question& question : kQuestions) {
@@ -112,13 +117,14 @@ class Observers::Desk final : public ipc::Observer {
 };
 
 Observers::Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor,
-                     Privacy& privacy, platform::FateRing& fates, double started)
+                     Privacy& privacy, platform::FateRing& fates, backends::PostSpool* spool, double started)
     : _services(services),
       _agent(agent),
       _clients(clients),
       _doctor(doctor),
       _privacy(privacy),
       _fates(fates),
+      _spool(spool),
       _started(started),
       _preferences(services.preferences, services.device) {}
 
@@ -141,7 +147,8 @@ Observers::Answer Observers::status(const Dictionary&) {
                            descriptorLimit()}};
   return Dictionary{{"daemon", statusOfDaemon(facts)},
                     {"storebags", statusOfStorebags(_agent.storebags(), facts.now)},
-                    {"servers", statusOfServers(_services.http.servers())}};
+                    {"servers", statusOfServers(_services.http.servers())},
+                    {"spool", statusOfSpool(_spool)}};
 }
 
 Observers::Answer Observers::sessions(const Dictionary& arguments) {
@@ -231,9 +238,27 @@ Observers::Answer Observers::purgeHistory(const Dictionary&) {
   return daemon::purgeHistory(_services.history);
 }
 
+Observers::Answer Observers::spool(const Dictionary& arguments) {
+  return spoolPage(_spool, arguments);
+}
+
+Observers::Answer Observers::sendSpool(const Dictionary&) {
+  return daemon::sendSpool(_spool);
+}
+
+Observers::Answer Observers::dropFromSpool(const Dictionary& arguments) {
+  return daemon::dropFromSpool(_spool, arguments);
+}
+
 Gauges Observers::gauges() {
-  return {_agent.sessionCount(), _clients.connectionCount(), _services.http.underWay(),
-          _services.memory.used(), _started};
+  const auto spooled = _spool ? _spool->queue().amount() : support::SpoolIndex::Amount();
+  return {_agent.sessionCount(),
+          _clients.connectionCount(),
+          _services.http.underWay(),
+          _services.memory.used(),
+          _started,
+          spooled.posts,
+          spooled.bytes};
 }
 
 std::string Observers::metricsText() {

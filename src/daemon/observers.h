@@ -14,6 +14,10 @@
 #include "ipc/connection.h"
 #include "platform/fate_ring.h"
 
+namespace veltrad::backends {
+class PostSpool;
+}  // namespace veltrad::backends
+
 namespace veltrad::ipc {
 class Listener;
 }  // namespace veltrad::ipc
@@ -29,7 +33,7 @@ class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
   Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
-            platform::FateRing& fates, double started);
+            platform::FateRing& fates, backends::PostSpool* spool, double started);
 
   // Whoever connects is accepted; each question asks for its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
@@ -64,6 +68,9 @@ class Observers final : public ipc::ListenerDelegate {
   Answer history(const Dictionary& arguments);
   Answer historyBody(const Dictionary& arguments);
   Answer purgeHistory(const Dictionary& arguments);
+  Answer spool(const Dictionary& arguments);
+  Answer sendSpool(const Dictionary& arguments);
+  Answer dropFromSpool(const Dictionary& arguments);
   double now() const;
 
   Services& _services;
@@ -72,6 +79,7 @@ class Observers final : public ipc::ListenerDelegate {
   Doctor& _doctor;
   Privacy& _privacy;
   platform::FateRing& _fates;
+  backends::PostSpool* const _spool;  // may be null
   const double _started;
   config::PreferenceEditor _preferences;
 };

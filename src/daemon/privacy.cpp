@@ -10,6 +10,7 @@
 #include <memory>
 
 #include "backends/backend_factory.h"
+#include "backends/https/post_spool.h"
 #include "config/preference_keys.h"
 #include "daemon/veltrad_agent.h"
 #include "platform/log.h"
@@ -23,6 +24,8 @@ using namespace std::chrono_literals;
 
 // The HTTP thread may be reading certificates.
 constexpr auto kHTTPPatience = 500ms;
+// Posts may be on their way to the disk.
+constexpr auto kSpoolPatience = 5s;
 constexpr std::string_view kCustomIdentifier = "uuid:";
 constexpr double kNotGiven = std::numeric_limits<double>::quiet_NaN();
 
@@ -131,22 +134,29 @@ Privacy::Answer Privacy::turnOff() {
     static_cast<void>(receipt.end());
     return Failure{stored.error()};
   }
+  // First, so that all is counted here: the spool drops it by itself once the word has changed.
+  std::size_t posts = emptySpool(wire::Reason::privacy_off);
   _graceRuns = obey() || _graceRuns;
   const auto begun = _services.http.refuseWaiting(false, kHTTPPatience);
+  posts += emptySpool(wire::Reason::privacy_off);
   for (const auto& client : _factory.preparingFiles()) receipt.add(http::Departure::Kind::file, client, 1);
   Dictionary dropped = receipt.end();
-  dropped.set("posts", 0);  // nothing is kept to be sent again
-  std::uint64_t posts = 0, events = 0, files = 0;
+  dropped.set("posts", posts);
+  std::uint64_t begunPosts = 0, events = 0, files = 0;
   for (const http::RequestUnderWay& one : begun ? *begun : std::vector<http::RequestUnderWay>()) {
     const bool post = one.lane == http::HTTPRequest::Lane::event;
-    posts += post ? 1 : 0;
+    begunPosts += post ? 1 : 0;
     events += post ? one.events : 0;
     files += one.lane == http::HTTPRequest::Lane::upload ? 1 : 0;
   }
   return Dictionary{{"reporting", "off"},
                     {"dropped", std::move(dropped)},
-                    {"underWay", Dictionary{{"posts", posts}, {"events", events}, {"files", files}}},
+                    {"underWay", Dictionary{{"posts", begunPosts}, {"events", events}, {"files", files}}},
                     {"onDisk", onDisk()}};
+}
+
+std::size_t Privacy::emptySpool(wire::Reason why) {
+  return _spool ? _spool->empty(why, std::chrono::steady_clock::now() + kSpoolPatience) : 0;
 }
 
 Dictionary Privacy::onDisk() const {
@@ -189,12 +199,14 @@ Privacy::Answer Privacy::resetIdentifiers() {
   _services.gate.identifiersReset();
   _graceRuns = obey() || _graceRuns;
   // What waits bears the identifiers before. Sessions take the new ones at their next call.
+  std::size_t posts = emptySpool(wire::Reason::refused_by_owner);
   static_cast<void>(_services.http.refuseWaiting(true, kHTTPPatience));
   _agent.dropIdentified();
   _factory.dropWaiting([](const std::string&) { return true; });
+  posts += emptySpool(wire::Reason::refused_by_owner);
   auto known = identifiers();
   if (!known) return Failure{known.error()};
-  return Dictionary{{"identifiers", std::move(known.value())}};
+  return Dictionary{{"identifiers", std::move(known.value())}, {"dropped", Dictionary{{"posts", posts}}}};
 }
 
 }  // namespace veltrad::daemon

@@ -13,6 +13,7 @@
 
 namespace veltrad::backends {
 class BackendFactory;
+class PostSpool;
 }  // namespace veltrad::backends
 
 namespace veltrad::support {
@@ -28,10 +29,10 @@ class Privacy {
  public:
   using Answer = Result<Dictionary, std::string>;
 
-  // What it takes outlives it.
+  // What it takes outlives it; `spool` may be null.
   Privacy(Services& services, VeltradAgent& agent, backends::BackendFactory& factory,
-          const support::Veltra& library)
-      : _services(services), _agent(agent), _factory(factory), _library(library) {}
+          const support::Veltra& library, backends::PostSpool* spool)
+      : _services(services), _agent(agent), _factory(factory), _library(library), _spool(spool) {}
 
   // Reads the owner's word again and, if it has changed, stops what may not leave any more. Main thread,
   // several times a second.
@@ -49,6 +50,8 @@ class Privacy {
 
  private:
   bool obey() REQUIRES(_mutex);
+  // Returns how many posts that were.
+  std::size_t emptySpool(wire::Reason why);
   const char* reporting() const;
   Result<Array, std::string> identifiers();
   Dictionary onDisk() const;
@@ -57,6 +60,7 @@ class Privacy {
   VeltradAgent& _agent;
   backends::BackendFactory& _factory;
   const support::Veltra& _library;
+  backends::PostSpool* const _spool;
 
   // One at a time hears the owner.
   Mutex _mutex OWNER_LOCK;

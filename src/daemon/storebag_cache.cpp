@@ -48,6 +48,15 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
   return taken(clientType, _cachedStorebags[name], std::move(answer));
 }
 
+std::shared_ptr<const config::StorebagSection> StorebagCache::sectionFor(std::int32_t clientType,
+                                                                         bool fetch) {
+  if (fetch) return storebagForClientType(clientType);
+  const char* name = config::storebagNameForClientType(clientType);
+  const Lock held(_lock);
+  const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
+  return at == _cachedStorebags.end() ? nullptr : used(at->second);
+}
+
 config::StorebagAnswer StorebagCache::refresh(std::int32_t clientType) {
   const char* name = config::storebagNameForClientType(clientType);
   recall(clientType, name);

@@ -8,6 +8,7 @@
 #include <optional>
 #include <string>
 
+#include "backends/https/spool_rules.h"
 #include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "daemon/lock_ranks.h"
@@ -46,7 +47,7 @@ CacheVerdict verdictOfRecord(const StorebagRecord& record, double now);
 
 inline constexpr int kSecondsBetweenAttempts = 900;
 
-class StorebagCache {
+class StorebagCache final : public backends::SectionSource {
  public:
   // Both outlive it.
   StorebagCache(config::StorebagSource& source, const platform::Clock& clock)
@@ -54,6 +55,8 @@ class StorebagCache {
 
   // The section for the client type, or null. May wait for a download for the same name, without the lock.
   std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
+  // The same for the spool; with `fetch` false, what the record holds.
+  std::shared_ptr<const config::StorebagSection> sectionFor(std::int32_t clientType, bool fetch) override;
   // Fetches the storebag of a client type that has one, however fresh or failed its record is, without a
   // condition, and takes the answer into the record as ever. May wait as above, and then for the server.
   config::StorebagAnswer refresh(std::int32_t clientType);

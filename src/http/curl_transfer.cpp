@@ -90,7 +90,7 @@ CurlTransfer::CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool 
       _completion(std::move(completion)),
       _blocking(blocking),
       _host(hostOf(_request.url)),
-      _bodySize(_request.fileBody ? _request.fileBody->bytes : _request.body.size()),
+      _bodySize(_request.fileBody ? _request.fileBody->bytes : body().size()),
       _arrived(now) {
   const bool waitsForItsLane =
       _request.lane == HTTPRequest::Lane::upload || _request.lane == HTTPRequest::Lane::logData;
@@ -161,7 +161,7 @@ Departure CurlTransfer::departure() const {
 }
 
 void CurlTransfer::recordIn(RequestGate& gate, const Departure& departure) {
-  _record = gate.record(departure, sentLines(_host, headerLines(_request.headers, _bodySize)), _request.body,
+  _record = gate.record(departure, sentLines(_host, headerLines(_request.headers, _bodySize)), body(),
                         _request.fileBody ? _request.fileBody->file : nullptr);
 }
 
@@ -169,7 +169,7 @@ void CurlTransfer::setBody(Options& options) {
   if (_request.method == HTTPRequest::Method::get) return options.set(CURLOPT_HTTPGET, 1L);
   options.set(CURLOPT_POST, 1L);
   options.set(CURLOPT_POSTFIELDSIZE_LARGE, static_cast<curl_off_t>(_bodySize));
-  if (!_request.fileBody) return options.set(CURLOPT_POSTFIELDS, _request.body.data());  // not copied
+  if (!_request.fileBody) return options.set(CURLOPT_POSTFIELDS, body().data());  // not copied
   // Without a seek function, because it is never sent twice.
   _sent = 0;
   options.set(CURLOPT_READFUNCTION, giveBody);
@@ -201,10 +201,11 @@ curl_socket_t CurlTransfer::openSocket(void* self, curlsocktype, curl_sockaddr* 
 }
 
 // Aborts on a kept connection that has ended. Also aborts a repeated post: libcurl repeats a request if a
-// kept connection ends without an answer, but the server may have read it, and a post must not be sent twice.
+// kept connection ends without an answer, but the server may have read it, and a post without an ID must not
+// be sent twice.
 int CurlTransfer::beforeRequest(void* self, char*, char*, int, int localPort) {
   auto& transfer = *static_cast<CurlTransfer*>(self);
-  if (transfer._attempts > 0 && transfer._request.method == HTTPRequest::Method::post)
+  if (transfer._attempts > 0 && transfer._request.method == HTTPRequest::Method::post && !transfer.isKept())
     return CURL_PREREQFUNC_ABORT;
   if (transfer._connection == Connection::kept && transfer._connections->ended(localPort)) {
     transfer._connection = Connection::ended;
@@ -274,14 +275,23 @@ HTTPResult CurlTransfer::result(CURLcode code) {
   long status = 0;
   curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
   const bool statusCounts = code == CURLE_OK || (answerTooLarge() && !_request.keepsAnswer);
-  if (statusCounts) return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body)};
+  if (statusCounts)
+    return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body), retryAfter()};
   HTTPError error{kindOf(code), {}, static_cast<int>(status), causeOf(code)};
+  error.retryAfter = retryAfter();
   try {
     error.description = describe(code);
   } catch (const std::bad_alloc&) {
     error.description = outOfMemory().description;
   }
   return Failure{std::move(error)};
+}
+
+std::chrono::seconds CurlTransfer::retryAfter() const {
+  constexpr curl_off_t kDay = 86'400;
+  curl_off_t seconds = 0;  // negative for a date in the past
+  curl_easy_getinfo(_easy, CURLINFO_RETRY_AFTER, &seconds);
+  return std::chrono::seconds(std::clamp<curl_off_t>(seconds, 0, kDay));
 }
 
 HTTPError::Kind CurlTransfer::kindOf(CURLcode code) const {

@@ -40,6 +40,9 @@ class CurlTransfer {
   bool hasBegun() const { return _begun; }
   // True at the first call.
   bool beginsFirst() { return !std::exchange(_begun, true); }
+  // Its sender keeps and records it.
+  bool isKept() const { return _request.isKept; }
+  bool isAgain() const { return _request.again; }
   std::uintptr_t sequence() const { return _request.sequence; }
   Time arrived() const { return _arrived; }
   // True if a thread waits in perform().
@@ -76,6 +79,8 @@ class CurlTransfer {
   template <typename Piece>
   bool collects(const Piece& piece);
   void collectHeader(std::string_view line);
+  const std::string& body() const { return _request.sharedBody ? *_request.sharedBody : _request.body; }
+  std::chrono::seconds retryAfter() const;
   bool answerTooLarge() const { return _received > _request.mostResponseBytes; }
   HTTPError::Kind kindOf(CURLcode code) const;
   HTTPError::Cause causeOf(CURLcode code) const;

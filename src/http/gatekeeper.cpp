@@ -25,9 +25,10 @@ std::optional<HTTPError> Gatekeeper::refusalOf(const CurlTransfer& transfer) con
 std::optional<HTTPError> Gatekeeper::overLimit(CurlTransfer& transfer) const {
   if (_gate == nullptr || transfer.lane() == HTTPRequest::Lane::storebag || !transfer.beginsFirst())
     return std::nullopt;
-  const Departure departure = transfer.departure();
+  Departure departure = transfer.departure();
+  if (transfer.isAgain()) departure.events = 0;
   if (auto refused = asError(_gate->count(departure))) return refused;
-  if (_gate->keepsRecords()) transfer.recordIn(*_gate, departure);
+  if (_gate->keepsRecords() && !transfer.isKept()) transfer.recordIn(*_gate, departure);
   return std::nullopt;
 }
 

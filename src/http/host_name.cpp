@@ -18,4 +18,10 @@ std::string hostName(const std::string& url) {
   return host;
 }
 
+std::string addressOf(std::string_view url) {
+  const std::size_t slashes = url.find("//");
+  const std::size_t host = slashes == std::string_view::npos ? 0 : slashes + 2;
+  return std::string(url.substr(0, url.find_first_of("/?#", host)));
+}
+
 }  // namespace veltrad::http

@@ -3,11 +3,14 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 namespace veltrad::http {
 
 // The host that a request to this URL would contact, without port; empty if it names none. By libcurl's own
 // parser, so that nobody's idea of an address differs from where the request goes.
 std::string hostName(const std::string& url);
+// Scheme, host and, where it is given, port, as the URL has them: "https://h.example:8443".
+std::string addressOf(std::string_view url);
 
 }  // namespace veltrad::http

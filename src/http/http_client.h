@@ -46,6 +46,13 @@ struct HTTPRequest {
   std::string body;
   // Instead of `body`.
   std::optional<FileBody> fileBody;
+  // Instead of `body`: one that its sender keeps, too.
+  std::shared_ptr<const std::string> sharedBody;
+  // Its sender keeps it and sends it again if it fails, and records it when that has ended. It bears an ID,
+  // so that the server takes it once, however often it comes.
+  bool isKept = false;
+  // It was begun before, so that its events have been counted.
+  bool again = false;
   // What the request and its completion keep, charged by the caller and released after the completion has
   // run.
   platform::Charge charge;
@@ -73,6 +80,8 @@ struct HTTPResponse {
   // Of the last answer; empty if the answer is not kept.
   HTTPHeaders headers;
   std::string body;
+  // What "Retry-After" asks for, at most a day; 0: nothing.
+  std::chrono::seconds retryAfter{0};
 
   // The first value under this name, letter case ignored.
   std::optional<std::string_view> header(std::string_view name) const;
@@ -96,6 +105,8 @@ struct HTTPError {
   std::optional<wire::Reason> refusal = std::nullopt;
   // The request had begun when it ended so.
   bool begun = false;
+  // As in HTTPResponse, of an incomplete answer.
+  std::chrono::seconds retryAfter{0};
 
   // False: nothing of the request has left the device.
   bool mayHaveArrived() const {

@@ -17,6 +17,7 @@ std::size_t keptBytes(const HTTPRequest& request) {
   // The transfer with its list entries, and the two copies of each header.
   constexpr std::size_t kTransfer = 1536, kCopies = 2, kHeader = 96;
   std::size_t bytes = kTransfer + 2 * request.url.capacity() + blockBytes(request.body.capacity());
+  if (request.sharedBody) bytes += blockBytes(request.sharedBody->capacity());
   for (const auto& [name, value] : request.headers) {
     bytes += kHeader + kCopies * (name.capacity() + value.capacity());
   }

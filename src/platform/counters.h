@@ -28,7 +28,9 @@ class Counters {
   void count(wire::Reason reason, std::uint64_t times = 1) {
     _counts->ofReason[static_cast<std::size_t>(reason)].fetch_add(times, std::memory_order_relaxed);
   }
-  void eventTaken() { _counts->eventsTaken.fetch_add(1, std::memory_order_relaxed); }
+  void eventTaken(std::uint64_t events = 1) {
+    _counts->eventsTaken.fetch_add(events, std::memory_order_relaxed);
+  }
   std::uint64_t value(wire::Reason reason) const {
     return _counts->ofReason[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
   }

@@ -47,7 +47,7 @@ bool settles(wire::Reason reason) {
     case wire::Reason::frame_too_large:
       return false;
     default:
-      return reason == wire::Reason::event_posted ||
+      return reason == wire::Reason::event_posted || reason == wire::Reason::kept_in_spool ||
              (wire::entryOf(reason).concern == "event" && saysLoss(wire::entryOf(reason)));
   }
 }

@@ -31,6 +31,7 @@ class Root {
   std::string allowancePath() const { return path("var/lib/veltrad/daily.json"); }
   std::string destinationsPath() const { return path("var/lib/veltrad/destinations.json"); }
   std::string historyDirectory() const { return path("var/lib/veltrad/history"); }
+  std::string spoolDirectory() const { return path("var/lib/veltrad/spool"); }
   std::string secretPath() const { return path("var/lib/veltrad/secret"); }
   // Storebags that survive a restart, a file a name.
   std::string storebagsDirectory() const { return path("var/lib/veltrad/storebags"); }

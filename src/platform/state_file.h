@@ -22,7 +22,7 @@ class FileStore;
 class StateFile {
  public:
   // Numbers that differ where the state differs; unused ones are 0.
-  using Version = std::array<std::uint64_t, 4>;
+  using Version = std::array<std::uint64_t, 5>;
   struct State {
     const char* name;  // as its line in the log begins: "The counters"
     // Both are called on the disk writer's thread, the first also on the main thread.

@@ -35,7 +35,7 @@ void WatchedContents::put(std::uint64_t message, const Dictionary* payload, cons
   if (payload) contents.set("payload", *payload);
   if (userInfo) contents.set("userInfo", *userInfo);
   Piece piece{message, writeBinaryPropertyList(contents)};
-  if (piece.contents.size() > kMostOfOne) piece.contents = {};
+  if (piece.contents.size() > kMostOfOne) std::string().swap(piece.contents);
   const Lock held(_mutex);
   if (_watching.load(std::memory_order_relaxed) == 0) return;
   _bytes += sizeOf(piece);

@@ -24,6 +24,7 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   backends::SessionFacts facts;
   facts.device.udid = deviceID;
   facts.take(oneShot.userInfo);
+  facts.connection = backends::connectionNumber(oneShot.facts.sessionIDString);
   const auto set = createBackends(making, oneShot.storebag, info, std::move(facts));
   if (!set) {
     logError("sendMessageWithSessionInfo: No backends available to send single message");

@@ -137,11 +137,11 @@ void VeltradSession::createBackends(const BackendSet* before) {
   facts.device.udid = _deviceid;
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
-  const config::StorebagSection& storebag = _storebag.section();
+  facts.connection = backends::connectionNumber(_sessionIDString);
   auto made = session::createBackends(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, false, _fates.comesFrom(storebag.origin, _sessionInfo), before},
-      &storebag, _sessionInfo.get(), std::move(facts));
+       _word.now(), _account, false, _fates.comesFrom(_storebag.section().origin, _sessionInfo), before},
+      &_storebag.section(), _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   cleanUp(made.get());  // those that were replaced
 }
@@ -335,11 +335,11 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
     return refuse(wire::Reason::no_identifiers);  // without a reply, which ends the client's call
   }
   _sessionID = info->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
-  backends::SharedDictionary kept;
-  backends::SharedDictionary identity;
+  backends::SharedDictionary kept, identity;
   if (!charged(std::move(info), kept) || !charged(std::move(userInfo), identity))
     return refuse(wire::Reason::message_over_share);
   _sessionInfo = kept;
+  hearOwner();
   receivedUserInfo(identity);
   logDebug("sendMessageWithSessionInfo: Sending message with session info for session %u", _sessionID);
   const auto storebag = _sessionDelegate.storebagForSession(*this);

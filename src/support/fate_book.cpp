@@ -37,6 +37,8 @@ std::optional<Fate> fateAfter(const wire::StepEntry& entry) {
       return Fate::dropped;
     case Step::lost:
       return Fate::lost;
+    case Step::kept:
+      return Fate::kept;
     default:
       return std::nullopt;
   }
@@ -68,8 +70,13 @@ void takeStep(BackendFate& fate, const ToldStep& step) {
   }
   if (entry.batch != 0) fate.batch = entry.batch;
   if (entry.post != 0) fate.post = entry.post;
-  if (step.text) fate.url = step.text;
-  if (entry.bytes != 0) fate.bytes = entry.bytes;
+  if (entry.step == Step::kept) {
+    fate.keptFor = step.text.value_or("");
+    fate.nextTry = entry.time + std::int64_t{entry.bytes} * 1'000'000;
+  } else {
+    if (step.text) fate.url = step.text;
+    if (entry.bytes != 0) fate.bytes = entry.bytes;
+  }
   if (entry.events != 0) fate.events = entry.events;
   if (entry.step == Step::sent || entry.step == Step::again) ++fate.transmissions;
   if (entry.step == Step::answered) fate.status = entry.status;

@@ -13,7 +13,7 @@
 
 namespace veltrad::support {
 
-// One message in one back end. Its 13 fields are what is told of it.
+// One message in one back end. Its 15 fields are what is told of it.
 struct BackendFate {
   std::optional<wire::StandingEntry> standing;  // none: the back end was not made
   wire::Fate fate = wire::Fate::none;
@@ -28,6 +28,9 @@ struct BackendFate {
   std::uint32_t bytes = 0;
   std::uint32_t events = 0;
   std::optional<int> status;
+  // While it is kept: what went wrong, and when its address is tried again, in microseconds since 1970.
+  std::string keptFor;
+  std::int64_t nextTry = 0;
   int transmissions = 0;
   std::vector<ToldStep> road;
 };

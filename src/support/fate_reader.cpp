@@ -109,6 +109,10 @@ std::vector<std::uint64_t> FateReader::messagesOf(const wire::StepEntry& entry) 
     if (entry.step == Step::posted) _posts[entry.post] = messages;
     return messages;
   }
+  if (entry.step == Step::kept || entry.step == Step::again) {
+    const auto found = _posts.find(entry.post);
+    return found == _posts.end() ? std::vector<std::uint64_t>() : found->second;
+  }
   auto post = _posts.extract(entry.post);
   return post ? std::move(post.mapped()) : std::vector<std::uint64_t>();
 }

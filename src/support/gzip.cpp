@@ -36,7 +36,7 @@ constexpr FailureText kTexts[] = {
      "The stream state was inconsistent (e.g., next_in or next_out was NULL)."},
     {Z_ERRNO, kUnknown, "Error occured while reading file."}};
 
-const char* textOf(int result, const char* FailureText::*when) {
+const char* failureText(int result, const char* FailureText::*when) {
   for (const FailureText& text : kTexts) {
     if (text.result == result) return text.*when;
   }
@@ -65,7 +65,7 @@ class Deflation {
     _begun = result == Z_OK;
     if (!_begun) {
       logError("compressDataWithZlibOrGzip: deflateInit2() Error: \"%s\" Message: \"%s\"",
-               textOf(result, &FailureText::atInitialisation), shown(stream.msg));
+               failureText(result, &FailureText::atInitialisation), shown(stream.msg));
     }
     return _begun;
   }
@@ -86,7 +86,7 @@ class Deflation {
   std::string_view made() const { return {_room.get(), kPieceBytes - stream.avail_out}; }
   void sayFailure(int result) const {
     logError("compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",
-             textOf(result, &FailureText::duringCompression), shown(stream.msg));
+             failureText(result, &FailureText::duringCompression), shown(stream.msg));
   }
 
   const int level;

@@ -15,6 +15,7 @@
 #include <chrono>
 #include <cmath>
 #include <cstring>
+#include <new>
 #include <vector>
 
 #include "base/file_descriptor.h"
@@ -27,8 +28,8 @@ namespace veltrad::support {
 
 namespace {
 constexpr double kExpirySeconds = 86'400;
-constexpr std::size_t kLineBytes = 128;  // the memory of a waiting line besides its text
-constexpr std::size_t kMostAtOnce = 64;  // lines in one call
+constexpr std::size_t kLineBytes = 128;       // the memory of a waiting line besides its text
+constexpr std::size_t kMostLinesAtOnce = 64;  // lines in one call
 constexpr std::string_view kPrefix = "veltrad_";
 constexpr std::string_view kSuffix = "_messageLog.diag";
 
@@ -124,8 +125,8 @@ void MessageLog::put(std::string_view format, std::initializer_list<std::string_
     const Lock held(_mutex);
     if (_bytes > 0 && (bytes > kMostBytes || _bytes > kMostBytes - bytes))
       return _counters.count(wire::Reason::log_line_queue_full);
-    _bytes += bytes;
     _waiting.push_back(std::move(line));
+    _bytes += bytes;
     if (_waiting.size() > 1) return;
   }
   using Put = platform::DiskWriter::Queue::Put;
@@ -153,8 +154,13 @@ void MessageLog::end(const std::vector<std::string>& lines) {
 void MessageLog::writeWaiting() {
   const std::vector<std::string> lines = takeWaiting();
   for (std::span<const std::string> left = lines; !left.empty();) {
-    const auto some = left.first(std::min(left.size(), kMostAtOnce));
-    if (!append(some)) _counters.count(wire::Reason::log_line_disk, some.size());
+    const auto some = left.first(std::min(left.size(), kMostLinesAtOnce));
+    bool written = false;
+    try {
+      written = append(some);
+    } catch (const std::bad_alloc&) {
+    }
+    if (!written) _counters.count(wire::Reason::log_line_disk, some.size());
     left = left.subspan(some.size());
   }
   end(lines);
@@ -167,7 +173,7 @@ bool MessageLog::append(std::span<const std::string> lines) {
   // Neither follows a link nor blocks.
   const FileDescriptor opened(
       open(file->path.c_str(), O_WRONLY | O_APPEND | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
-  iovec pieces[kMostAtOnce];
+  iovec pieces[kMostLinesAtOnce];
   std::size_t bytes = 0;
   for (std::size_t i = 0; i < lines.size(); ++i) {
     pieces[i] = {const_cast<char*>(lines[i].data()), lines[i].size()};

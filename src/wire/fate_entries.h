@@ -103,7 +103,8 @@ struct StandingEntry {
   std::uint64_t more[3] = {};
 };
 
-// A step of a message, of a batch or of a post.
+// A step of a message, of a batch or of a post. Of one that is kept, `text` is what went wrong, and `bytes`
+// are the seconds until its address is tried again.
 struct StepEntry {
   EntryKind kind = EntryKind::step;
   Step step = Step::none;

@@ -18,7 +18,8 @@ namespace veltrad::wire {
 // none: the back end takes no such message. held: in a batch until the back end's state is decided. posted:
 // the post has begun. waiting: a datagram waits for its acknowledgement, or for room in the socket. sent: a
 // datagram that nobody acknowledges. written: to the energy log. delivered: to the adaptor. lost: a post
-// without an answer, which may have arrived. given_up: a datagram that was never acknowledged.
+// without an answer, which may have arrived. given_up: a datagram that was never acknowledged. kept: a post
+// in the spool, to be sent again.
 enum class Fate : std::uint8_t {
   none,
   dropped,
@@ -31,13 +32,14 @@ enum class Fate : std::uint8_t {
   delivered,
   lost,
   acknowledged,
-  given_up
+  given_up,
+  kept
 };
 
-inline constexpr std::string_view kFateNames[] = {"none",      "dropped", "held",         "batched",
-                                                  "posted",    "waiting", "sent",         "written",
-                                                  "delivered", "lost",    "acknowledged", "given_up"};
-static_assert(std::size(kFateNames) == static_cast<std::size_t>(Fate::given_up) + 1);
+inline constexpr std::string_view kFateNames[] = {
+    "none",    "dropped",   "held", "batched",      "posted",   "waiting", "sent",
+    "written", "delivered", "lost", "acknowledged", "given_up", "kept"};
+static_assert(std::size(kFateNames) == static_cast<std::size_t>(Fate::kept) + 1);
 
 constexpr std::string_view nameOf(Fate fate) {
   return kFateNames[static_cast<std::size_t>(fate)];

@@ -198,7 +198,8 @@ TEST(StorebagTrust, RemembersOverARestartAndVouchesForNothingOnceThatIsTorn) {
        "3 " + line + "what was seen of earlier ones cannot be read: " + path +
            ": torn, or not written by this program",
        "4 Storebag 'quindle': its serial and revocations will not be known after the next start: " + path +
-           ": No space left on device"});
+           ": No space left on device",
+       "3 " + line + "serial 6 is lower than 7"});
   EXPECT_EQ(refusal(device.trust, 5), std::nullopt);
   choices.keys.texts = {"second"};
   EXPECT_EQ(device.files.mode(path), 0600u);
@@ -221,13 +222,15 @@ TEST(StorebagTrust, RemembersOverARestartAndVouchesForNothingOnceThatIsTorn) {
   device.files.failReads(path, {});
   device.files.put(path, whole);
   device.files.failWrites(FakeFileStore::Kind::noSpace);
-  // What cannot be written holds for this process.
+  // What cannot be written holds for this process, and is written with the next accepted one.
   EXPECT_EQ(restarted([&](auto& trust) {
               EXPECT_EQ(refusal(trust, 7), std::nullopt);
+              EXPECT_EQ(*device.files.bytes(path), whole);
+              device.files.failWrites({});
               return refusal(trust, 7);
             }),
             std::nullopt);
-  EXPECT_EQ(*device.files.bytes(path), whole);
+  EXPECT_EQ(restarted([&](auto& trust) { return refusal(trust, 6); }), Reason::storebag_rolled_back);
 }
 
 }  // namespace

@@ -3,7 +3,7 @@
 """Runs the tests with real processes: all of them, or those given as arguments (road, test_road.Road.test_examples).
 
 VELTRA_BUILD is the build directory, by default build/dev. Each class runs in its own process; four run at a time on two cores,
-because they mostly wait. The last line is "N passed, N failed"; the exit status is 1 if any test failed."""
+because they mostly wait, and those with `alone` one after the other at the end. The last line is "N passed, N failed"; the exit status is 1 if any test failed."""
 import concurrent.futures
 import os
 import pathlib
@@ -48,13 +48,15 @@ def main(names):
     for test in leaves(unittest.defaultTestLoader.loadTestsFromNames(names)):
         classes.setdefault(type(test), []).append(test.id())
     total_passed = total_failed = 0
-    with concurrent.futures.ThreadPoolExecutor(2 * min(2, os.cpu_count() or 1)) as pool:
-        for done in concurrent.futures.as_completed([pool.submit(run_apart, ids) for ids in classes.values()]):
-            name, passed, failed, seconds, output = done.result()
-            total_passed, total_failed = total_passed + passed, total_failed + failed
-            print(f"{name}: {passed} passed, {failed} failed, {seconds:.1f} s", flush=True)
-            skipped = [line for line in output.split("\n") if line.startswith("SKIPPED ")]
-            print(output if failed else "\n".join(skipped), end="\n" if failed or skipped else "", flush=True)
+    for alone, workers in ((False, 2 * min(2, os.cpu_count() or 1)), (True, 1)):
+        chosen = [ids for kind, ids in classes.items() if getattr(kind, "alone", False) == alone]
+        with concurrent.futures.ThreadPoolExecutor(workers) as pool:
+            for done in concurrent.futures.as_completed([pool.submit(run_apart, ids) for ids in chosen]):
+                name, passed, failed, seconds, output = done.result()
+                total_passed, total_failed = total_passed + passed, total_failed + failed
+                print(f"{name}: {passed} passed, {failed} failed, {seconds:.1f} s", flush=True)
+                skipped = [line for line in output.split("\n") if line.startswith("SKIPPED ")]
+                print(output if failed else "\n".join(skipped), end="\n" if failed or skipped else "", flush=True)
     print(f"{total_passed} passed, {total_failed} failed")
     return 1 if total_failed or not total_passed else 0
 

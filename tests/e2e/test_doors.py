@@ -107,6 +107,8 @@ class Doors(SystemTest):
 
 
 class Crowd(SystemTest):
+    alone = True  # it measures time, and its crowd takes every core
+
     def test_a_refused_user_delays_nobody(self):
         def flood():
             os.setuid(65534)
@@ -123,7 +125,7 @@ class Crowd(SystemTest):
                 one.start()
             try:
                 waits = []
-                for _ in range(200):
+                for _ in range(100):
                     begin = time.monotonic()
                     Wire(self.root).close()
                     waits.append(time.monotonic() - begin)
@@ -131,8 +133,8 @@ class Crowd(SystemTest):
                 for one in crowd:
                     one.kill()
                     one.join()
-            # 0.1 s on an idle machine; here other tests, and perhaps other builds, run at the same time.
-            self.assertLess(sorted(waits)[-3], 0.1 if BUILD.name == "release" else 1, "seconds to a greeting at the 99th percentile")
+            # 0.1 s of the program as it ships, on an idle machine; perhaps something else is built at the same time.
+            self.assertLess(sorted(waits)[-2], 0.1 if BUILD.name == "release" else 1, "seconds to a greeting at the 99th percentile")
 
 
 class Stop(SystemTest):

@@ -293,7 +293,8 @@ class ExplainedAndDone(SystemTest):
                 same(f"{name} addresses", [one["url"] for one in says["fates"]], [one.get("url") for one in of])
                 self.compare_events(name, says["events"], left.get((name, session.number), []), same)
             if name == "dashboard" and says["state"] == 2:
-                same("texts", says["texts"], [texts.get((session.number, one["eventNumber"])) for one in of])
+                same("texts", says["texts"], [re.sub("=[0-9a-f]{64}", "=null", texts.get((session.number, one["eventNumber"]), "none"))
+                                              for one in of])
             changed = [one for one in [does] * (name in HTTPS) + of if one["fate"] in ("posted", "written", *SENT)]
             for key in ("removed", "hashed"):
                 same(f"{name} {key}", says[key], sorted({field for one in changed for field in one[key]}))
@@ -366,4 +367,4 @@ class ExplainedAndCompared(unittest.TestCase):
                 self.assertTrue(said or not now - was, (SEED, world.number, session, now - was, changes, *bags))
             tried += 1
         print(f"{tried} changes, {more} sessions in which more leaves", flush=True)
-        self.assertGreater(more, tried / 10)
+        self.assertGreater(more, tried / 50)

@@ -9,7 +9,7 @@ import socket
 import struct
 import unittest
 
-from harness import DEADLINE, Lab, storebag
+from harness import DEADLINE, Lab, storebag, wait_until
 
 
 class LabAlone(unittest.TestCase):
@@ -66,6 +66,22 @@ class LabAlone(unittest.TestCase):
         self.assertNotIn("<script>", page)
         for body, status in ((gzip.compress(bytes(65 << 20)), 413), (b"no gzip", 400)):
             self.assertEqual(self.lab.request("POST", "/events", body, {"Content-Encoding": "gzip"})[0].status, status)
+
+    def test_a_script_is_followed_and_what_comes_twice_is_told_by_its_id(self):
+        steps = [{"status": 429, "headers": {"Retry-After": "7"}}, {"status": 503, "times": 2}, {"status": 500, "forMs": 200}]
+        self.lab.control(path="/events", script=steps)
+
+        def post(identifier):
+            response = self.lab.request("POST", "/events", b"{}", {"X-VLT-Post-ID": identifier})[0]
+            return response.status, response.headers["Retry-After"]
+        self.assertEqual([post(name) for name in ("a", "b", "a", "c")], [(429, "7"), (503, None), (503, None), (500, None)])
+        wait_until(lambda: post("d")[0] == 200, "the end of the script")
+        self.assertEqual(post("a"), (200, None))
+        doubles = json.loads(self.lab.request("GET", "/doubles")[1])
+        self.assertEqual((doubles["ids"], doubles["doubles"]["a"], "b" in doubles["doubles"]), (4, 3, False))
+        self.assertEqual([line["double"] for line in self.lab.received("events")[:4]], [False, False, True, False])
+        response, body = self.lab.request("POST", "/control", json.dumps({"path": "/events", "script": [{"path": "/a"}]}))
+        self.assertEqual((response.status, b'"script": expected an array of rules without paths' in body), (400, True))
 
     def test_uploads(self):
         plain = bytes(65 << 20) + b"end"

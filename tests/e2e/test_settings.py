@@ -50,10 +50,10 @@ class Configuration(SystemTest):
             with self.subTest(broken), self.serving("Settings", "No storebag is accepted for client type 6") as daemon:
                 self.assertIsNone(self.open(6)[1])
                 daemon.wait_for_line(f"no storebag is accepted: {self.root.path}/{SETTINGS}:{place}")
-                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1, "spool": {"days": 3}}')
+                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1, "jitter": 0.5}')
                 self.assertEqual(self.open(6)[1], ["httppost"])
                 daemon.wait_for_line(':1:23: unknown key "speed": expected one of sampling, storebags, ')
-                daemon.wait_for_line(':1:45: "days" has no effect in this version')
+                daemon.wait_for_line(':1:35: "jitter" has no effect in this version')
                 self.root.write(SETTINGS, comments(broken))
                 self.assertEqual(self.open(7)[1], ["httppost"])
                 daemon.wait_for_line("Settings could not be read, the last ones stand: ")

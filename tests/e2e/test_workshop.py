@@ -167,7 +167,7 @@ class Workshop(unittest.TestCase):
             told = run("explain", bare, *options)
             self.assertEqual((told[0], told[1]), (status, ""), options)
             self.assertIn(said, told[2])
-        told = json.loads(run("explain", "--json", bare, "--country", "us", "--require-user-info", "--client", "x")[1])
+        told = json.loads(run("explain", "--json", bare, "--client-type", 7, "--country", "us", "--require-user-info", "--client", "x")[1])
         self.assertEqual(told["backends"]["httppost"]["reason"], "reports")
 
     def edited(self, storebag, edits):
@@ -212,7 +212,7 @@ class Workshop(unittest.TestCase):
         recorded = self.file("recorded", "".join(json.dumps(line) + "\n" for line in lines))
         old = self.file("old", bag(client="phone", filters=[{"key": "peer", "action": "remove"}, {"key": "number", "action": "sha256"}]))
         new = self.file("new", bag(client="phone", post_url="https://d.example/e"))
-        options = ("--messages", recorded, "--country", "US", "--consent", "yes", "--draw", "0.4")
+        options = ("--messages", recorded, "--client-type", 7, "--country", "US", "--consent", "yes", "--draw", "0.4")
         status, text, _ = run("diff", "--json", *options, old, new)
         self.assertEqual((status, json.loads(text)["messages"]), (1, {"total": 3, "changed": 2, "list": [
             {"line": 1, "was": "httppost: posted to https://c.example/e, without peer, with hashed number",

@@ -100,6 +100,33 @@ TEST(FateRing, ATextStandsAsLongAsTheLastEntryThatNamesIt) {
             longest.substr(0, FateRing::kLongestText));
 }
 
+TEST(FateBook, FollowsAPostThroughTheSpool) {
+  Record record;
+  const platform::FatePen pen(&record.ring, "httppost");
+  const std::uint64_t message = record.message(record.session("lamp"));
+  wire::StepEntry posted;
+  posted.message = message;
+  posted.post = 4;
+  posted.bytes = 77;
+  posted.text = pen.textOf("https://h.test/events");
+  pen.write(Step::posted, std::nullopt, posted);
+  wire::StepEntry kept;
+  kept.post = 4;
+  kept.bytes = 12 * 60;
+  kept.text = pen.textOf("HTTP 503");
+  pen.write(Step::kept, Reason::kept_in_spool, kept);
+  const auto told = [&] { return record.book().messages().at(message).backends.at("httppost"); };
+  EXPECT_TRUE(told().fate == Fate::kept && told().keptFor == "HTTP 503" && told().bytes == 77 &&
+              told().url == "https://h.test/events");
+  EXPECT_EQ(told().nextTry - told().road.back().entry.time, 720'000'000);
+  wire::StepEntry end;
+  end.post = 4;
+  pen.write(Step::again, std::nullopt, end);
+  end.status = 200;
+  pen.write(Step::answered, Reason::event_posted, end);
+  EXPECT_TRUE(told().fate == Fate::posted && told().status == 200 && told().road.size() == 4);
+}
+
 TEST(FateBook, FollowsEachMessageThroughItsBatchAndPost) {
   Record record;
   const platform::FatePen https(&record.ring, "httppost"), dashboard(&record.ring, "dashboard");

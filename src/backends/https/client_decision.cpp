@@ -61,24 +61,22 @@ void decideOnSampling(const config::ClientEntry& entry, const ClientFacts& facts
 }
 }  // namespace
 
+std::optional<wire::Reason> refusalBeforeSampling(const config::ClientEntry& entry,
+                                                  const ClientFacts& facts) {
+  if (entry.overrideDNU != 1 && !facts.consent) return wire::Reason::no_consent;
+  if (auto refused = refusalOfLists(entry, facts)) return refused;
+  return entry.filters ? std::nullopt : std::optional(wire::Reason::no_filters);
+}
+
 ClientVerdict decideOnClient(const config::ClientEntry& entry, const ClientFacts& facts) {
   ClientVerdict verdict;
   verdict.state = kBackendDisabled;
   verdict.hierarchy = entry.hierarchy;
   verdict.overrideDNU = entry.overrideDNU;
-  if (verdict.overrideDNU == 1) {
-    verdict.dnuType = facts.consent ? 2 : 1;
-  } else if (!facts.consent) {
-    verdict.reason = wire::Reason::no_consent;
-    return verdict;
-  }
-  verdict.reason = refusalOfLists(entry, facts);
+  if (verdict.overrideDNU == 1) verdict.dnuType = facts.consent ? 2 : 1;
+  verdict.reason = refusalBeforeSampling(entry, facts);
   if (verdict.reason) return verdict;
-  verdict.filters = entry.filters ? &*entry.filters : nullptr;
-  if (!verdict.filters) {
-    verdict.reason = wire::Reason::no_filters;
-    return verdict;
-  }
+  verdict.filters = &*entry.filters;
   decideOnSampling(entry, facts, verdict);
   return verdict;
 }

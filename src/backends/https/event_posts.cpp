@@ -9,9 +9,12 @@
 #include <utility>
 
 #include "backends/https/json_fields.h"
+#include "backends/https/post_spool.h"
+#include "backends/https/spool_verdicts.h"
 #include "config/operator_settings.h"
 #include "platform/counters.h"
 #include "platform/log.h"
+#include "wire/constants.h"
 
 namespace veltrad::backends {
 
@@ -32,6 +35,38 @@ wire::Reason reasonOf(const http::HTTPError& error) {
                                                              : wire::Reason::refused_by_owner;
   }
   return wire::Reason::post_failed;
+}
+
+// Whether the owner keeps back a name by which the client entry is chosen.
+bool hidesNames(const SessionFacts& facts) {
+  const auto name = [](const SharedDictionary& info, const char* key) {
+    return info ? info->string(key) : nullptr;
+  };
+  for (const char* key : {wire::kVeltraUserInfoClientName, wire::kVeltraUserInfoServiceName}) {
+    const std::string* given = name(facts.userInfo, key);
+    const std::string* sent = name(facts.sentUserInfo, key);
+    if (given && (!sent || *given != *sent)) return true;
+  }
+  return false;
+}
+
+// What is needed to send it again. The request shares its body.
+void takeForSpool(const std::shared_ptr<SpooledPost>& post, const SessionFacts& facts,
+                  http::HTTPRequest& request) {
+  support::SpoolEntry& entry = post->entry;
+  entry.url = request.url;
+  entry.headers = request.headers;
+  entry.body = std::move(request.body);
+  entry.events = static_cast<std::uint32_t>(request.events);
+  entry.uid = facts.account ? facts.account->uid() : 0;
+  entry.connection = facts.connection;
+  entry.asksEntry = facts.requireUserInfo;
+  if (request.client) entry.client = *request.client;
+  entry.about = request.about;
+  entry.namesHidden = hidesNames(facts);
+  post->charge = std::move(request.charge);
+  request.sharedBody = std::shared_ptr<const std::string>(post, &entry.body);
+  request.isKept = true;
 }
 
 void logPostError(const std::optional<std::string>& text) {
@@ -55,14 +90,14 @@ JSONMessage EventPosts::createMessageForPostAndLogging(std::vector<std::string> 
   return message;
 }
 
-std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
-                                                        const SessionFacts& facts,
-                                                        const std::optional<std::string>& url, Post post) {
+std::optional<wire::Decision> EventPosts::postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                                          const SessionFacts& facts,
+                                                          const std::optional<std::string>& url, Post post) {
   if (!url) {
     _counters.count(wire::Reason::post_url_nil, post.eventCount);
     backEnd->pen().write(wire::Step::dropped, wire::Reason::post_url_nil, post.fate);
     if (post.completion) post.completion(std::nullopt, wire::makeReportingError("postURL is nil", -1));
-    return wire::Reason::post_url_nil;
+    return wire::Decision{wire::Fate::dropped, wire::Reason::post_url_nil};
   }
   http::HTTPRequest request =
       makePostRequest(facts, *url, post.text, post.eventMap, {_gzip, compressionLevel()});
@@ -71,8 +106,13 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
   request.about = std::move(post.about);
   request.sequence = reinterpret_cast<std::uintptr_t>(backEnd.get());
   request.charge = std::move(post.charge);
-  if (facts.account && !request.charge.resize(http::keptBytes(request) + post.completionBytes)) {
-    return refusePost(*backEnd, post.eventCount, post.completion, post.fate);
+  const bool charged =
+      !facts.account || request.charge.resize(http::keptBytes(request) + post.completionBytes);
+  if (_spool)
+    return postOrKeep(backEnd, facts, std::move(request), post.fate, std::move(post.completion), charged);
+  if (!charged) {
+    return wire::Decision{wire::Fate::dropped,
+                          refusePost(*backEnd, post.eventCount, post.completion, post.fate)};
   }
   backEnd->postBegins();
   const std::uint64_t number = notePost(*backEnd, request, post.fate);
@@ -85,9 +125,64 @@ std::optional<wire::Reason> EventPosts::postJSONMessage(const std::shared_ptr<Ve
   };
   if (const auto started = _http.start(std::move(request), answered); !started) {
     answered(Failure{started.error()});
-    return reasonOf(started.error());
+    return wire::Decision{wire::Fate::dropped, reasonOf(started.error())};
   }
   return std::nullopt;
+}
+
+std::optional<wire::Decision> EventPosts::postOrKeep(const std::shared_ptr<VeltraBackend>& backEnd,
+                                                     const SessionFacts& facts, http::HTTPRequest request,
+                                                     const wire::StepEntry& fate,
+                                                     VeltraBackend::FlushCompletion completion,
+                                                     bool charged) {
+  constexpr wire::Decision kKept{wire::Fate::kept, wire::Reason::kept_in_spool};
+  const auto post = std::make_shared<SpooledPost>();
+  post->entry.id = support::newPostID();
+  request.headers.emplace_back("X-VLT-Post-ID", support::textOf(post->entry.id));
+  post->fate = notePost(*backEnd, request, fate);
+  takeForSpool(post, facts, request);
+  backEnd->postBegins();
+  if (const auto refusal = _spool->admit(*post)) {
+    const std::string why = "Kept for later: " + *refusal;
+    post->entry.lastError = *refusal;
+    backEnd->postEnded(why);
+    _spool->keep(post);
+    if (completion) completion(std::nullopt, wire::makeReportingError(why, -1));
+    return kKept;
+  }
+  const auto answered = [this, backEnd, post,
+                         completion = std::move(completion)](const http::HTTPResult& result) {
+    endedOrKept(*backEnd, post, completion, result);
+  };
+  const http::HTTPError tooMany{http::HTTPError::Kind::tooMany, "Too many posts under way"};
+  const auto started =
+      charged ? _http.start(std::move(request), answered) : Result<Done, http::HTTPError>(Failure{tooMany});
+  if (started) return std::nullopt;
+  answered(Failure{started.error()});
+  const bool kept = isToBeKept(Failure{started.error()});
+  return kept ? kKept : wire::Decision{wire::Fate::dropped, reasonOf(started.error())};
+}
+
+void EventPosts::endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<SpooledPost>& post,
+                             const VeltraBackend::FlushCompletion& completion,
+                             const http::HTTPResult& result) {
+  backEnd.postEnded(outcomeOf(result));
+  std::optional<wire::ReportingError> error;
+  if (!isToBeKept(result)) {
+    noteEnd(backEnd, result, post->fate);
+    error = handleAnswer(backEnd, result, post->entry.url, post->entry.events);
+  } else if (result) {
+    const int status = result.value().status;
+    error =
+        wire::makeReportingError(fmt::format("The server answered {}, and the post is kept", status), status);
+    logDebug("HTTPSPostBackend(postJsonMessage): posted to %s: %s", post->entry.url.c_str(),
+             error->description.c_str());
+  } else {
+    error = wire::makeReportingError(result.error().description, -1);
+    logPostError(_errorLine.happened(error->description));
+  }
+  _spool->ended(post, result);
+  if (completion) completion(std::nullopt, std::move(error));
 }
 
 // Returns the post's number in the record.

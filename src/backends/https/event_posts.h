@@ -20,12 +20,16 @@ class OperatorSettings;
 
 namespace veltrad::backends {
 
-// One object serves all HTTPS post back ends. It outlives them and their posts.
+class PostSpool;
+struct SpooledPost;
+
+// One object serves all HTTPS post back ends. It outlives them and their posts, and what its constructor
+// takes outlives it. Without a spool posts that fail are lost.
 class EventPosts {
  public:
   EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters,
-             config::OperatorSettings& choices)
-      : _http(http), _clock(clock), _counters(counters), _choices(choices) {}
+             config::OperatorSettings& choices, PostSpool* spool = nullptr)
+      : _http(http), _clock(clock), _counters(counters), _choices(choices), _spool(spool) {}
 
   struct Post {
     PostText text;
@@ -45,11 +49,13 @@ class EventPosts {
   void restrict(Dictionary& event) const;
   JSONMessage createMessageForPostAndLogging(std::vector<std::string> events, const std::string& clientID,
                                              bool wantPretty) const;
-  // The post keeps the back end alive. A status of 5xx disables the back end. Returns why the post has not
-  // begun, if it has not.
-  std::optional<wire::Reason> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
-                                              const SessionFacts& facts,
-                                              const std::optional<std::string>& url, Post post);
+  // The post keeps the back end alive. A status of 5xx disables the back end, unless the post is kept.
+  // Returns what has become of the post if it has not begun.
+  std::optional<wire::Decision> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
+                                                const SessionFacts& facts,
+                                                const std::optional<std::string>& url, Post post);
+  // Failed posts are kept, so that `about` is of use.
+  bool keepsPosts() const { return _spool != nullptr; }
   // Counts the events as lost, under the reason that it returns, and calls `completion`, if there is one.
   wire::Reason refusePost(VeltraBackend& backEnd, std::size_t eventCount,
                           const VeltraBackend::FlushCompletion& completion, const wire::StepEntry& fate);
@@ -62,6 +68,13 @@ class EventPosts {
   static std::uint64_t notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
                                 wire::StepEntry fate);
   static void noteEnd(const VeltraBackend& backEnd, const http::HTTPResult& result, std::uint64_t post);
+  std::optional<wire::Decision> postOrKeep(const std::shared_ptr<VeltraBackend>& backEnd,
+                                           const SessionFacts& facts, http::HTTPRequest request,
+                                           const wire::StepEntry& fate,
+                                           VeltraBackend::FlushCompletion completion, bool charged);
+  // The end of a post that may be kept.
+  void endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<SpooledPost>& post,
+                   const VeltraBackend::FlushCompletion& completion, const http::HTTPResult& result);
   int compressionLevel();
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
                                                    const std::string& url, std::size_t eventCount);
@@ -70,6 +83,7 @@ class EventPosts {
   const platform::Clock& _clock;
   platform::Counters& _counters;
   config::OperatorSettings& _choices;
+  PostSpool* const _spool;
 
   // Shared, so that many sessions log no more lines than one.
   platform::LimitedLine _errorLine{"posts"};

@@ -162,7 +162,8 @@ void HTTPSPostBackend::addOwnersEdits(const SessionFacts& facts, const MessageNo
 }
 
 Dictionary HTTPSPostBackend::about(const SessionFacts& facts, const config::EditedFields& edits) const {
-  return recorded() ? aboutDeparture(name(), facts, _clientState.entry(), edits) : Dictionary();
+  return recorded() || _posts.keepsPosts() ? aboutDeparture(name(), facts, _clientState.entry(), edits)
+                                           : Dictionary();
 }
 
 Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
@@ -194,11 +195,11 @@ Sent HTTPSPostBackend::postEvent(WrittenEvent event, const SessionFacts& facts,
   }
   const PostLinks& links = _clientState.links();
   const wire::Reason why = stateVerdict().reason;  // before an answer can change it
-  const auto refused =
+  const auto ended =
       _posts.postJSONMessage(shared_from_this(), facts, realtime ? links.realtimePostURL() : links.postURL(),
                              {std::move(posted.text), EventMap{message.method, message.respCode}, 1,
                               std::move(*charge), 0, nullptr, about(facts, event.edits), fate});
-  if (refused) return {{wire::Fate::dropped, *refused}, std::move(result)};
+  if (ended) return {*ended, std::move(result)};
   return {{wire::Fate::posted, why}, std::move(result)};
 }
 

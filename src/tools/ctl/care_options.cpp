@@ -110,6 +110,26 @@ void addRefreshAndReport(CLI::App& app, Options& options) {
       "--yes is required.\n\nExample:\n  veltractl report --output veltra-report.txt");
 }
 
+void addSpool(CLI::App& app, Options& options) {
+  CLI::App* spool = addCommand(app, options, Command::spool, "spool",
+                               "Show the posts that failed and are kept to be sent again")
+                        ->group(kCareGroup);
+  spool->final_callback([&options, spool] {
+    if (spool->get_subcommands().empty()) options.command = Command::spool;
+  });
+  spool->require_subcommand(0, 1);
+  addCommand(*spool, options, Command::spool, "list", "The same as without a command");
+  addCommand(*spool, options, Command::spoolSend, "send",
+             "Send them now: no address waits, whatever its server has asked for");
+  addCommand(*spool, options, Command::spoolDrop, "drop", "Remove posts for good, unsent")
+      ->add_option("id", options.care.ids, "Posts, as `veltractl spool` shows them")
+      ->type_name("")
+      ->required();
+  spool->footer(
+      "Kept only if \"spool\" in etc/veltrad/settings.json says so. Oldest first; with --json one object a "
+      "line.\n\nExamples:\n  veltractl spool\n  veltractl spool send");
+}
+
 }  // namespace
 
 void addCare(CLI::App& app, Options& options) {
@@ -124,6 +144,7 @@ void addCare(CLI::App& app, Options& options) {
   addFates(app, options);
   addConfig(app, options);
   addRefreshAndReport(app, options);
+  addSpool(app, options);
   addDoctor(app, options);
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
                                "Show what happened to messages, by reason, with counts")

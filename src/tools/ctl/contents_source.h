@@ -29,7 +29,7 @@ class ContentsSource {
   // Of messages that nobody has asked for yet; those with the lowest numbers make room.
   static constexpr std::size_t kMostBytes = 8u << 20;
   // Sessions send at the same time, so that the order of numbers is nearly that of arrival.
-  static constexpr std::uint64_t kDisorder = 64;
+  static constexpr std::uint64_t kDisorder = 4096;
 
   void take(const Dictionary& piece);
   std::optional<Dictionary> taken(std::uint64_t message);

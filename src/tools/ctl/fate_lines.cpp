@@ -91,10 +91,12 @@ Dictionary lineOfStep(const support::ToldStep& step) {
   Dictionary line{{"time", secondsOf(entry.time)}, {"step", wire::nameOf(entry.step)}};
   if (const auto reason = wire::reasonIn(entry.reason)) line.set("reason", wire::entryOf(*reason).name);
   if (!step.names.empty()) line.set("fields", arrayOf(step.names));
-  if (step.text) line.set(entry.step == wire::Step::aggregated ? "to" : "url", *step.text);
+  const bool kept = entry.step == wire::Step::kept;
+  if (step.text) line.set(kept ? "error" : entry.step == wire::Step::aggregated ? "to" : "url", *step.text);
   if (entry.batch != 0) line.set("batch", entry.batch);
   if (entry.post != 0) line.set("post", entry.post);
-  if (entry.bytes != 0) line.set("bytes", unsigned{entry.bytes});
+  if (kept) line.set("nextTry", secondsOf(entry.time) + entry.bytes);
+  if (entry.bytes != 0 && !kept) line.set("bytes", unsigned{entry.bytes});
   if (entry.events != 0) line.set("events", unsigned{entry.events});
   if (entry.step == wire::Step::answered) line.set("status", unsigned{entry.status});
   return line;

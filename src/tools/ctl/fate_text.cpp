@@ -4,10 +4,12 @@
 
 #include <fmt/format.h>
 
+#include <chrono>
 #include <cmath>
 #include <ctime>
 
 #include "base/text.h"
+#include "tools/ctl/status_report.h"
 
 namespace veltrad::ctl {
 
@@ -63,6 +65,8 @@ std::string wordsOf(const support::ToldStep& step) {
       return "sent again";
     case Step::acknowledged:
       return "acknowledged" + (reason == wire::Reason::acknowledged_by_number ? why(reason) : "");
+    case Step::kept:
+      return "kept in the spool: " + shown(step.text);
     case Step::given_up:
       return "given up" + why(reason);
     case Step::dropped:
@@ -76,6 +80,13 @@ std::string wordsOf(const support::ToldStep& step) {
     default:
       return std::string(wire::nameOf(entry.step));
   }
+}
+
+std::string keptText(const support::BackendFate& fate) {
+  const auto now = std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+  const double wait = static_cast<double>(fate.nextTry) / 1e6 - now;
+  return "kept: " + escapedForLog(fate.keptFor) + "; next try " +
+         (wait > 0 ? "in " + formatDuration(wait) : "at its turn");
 }
 
 // Where it is now.
@@ -101,6 +112,8 @@ std::string endOf(const support::BackendFate& fate) {
       return "handed to the adaptor";
     case Fate::given_up:
       return "given up" + why(fate.reason);
+    case Fate::kept:
+      return keptText(fate);
     default:
       return std::string(wire::nameOf(fate.fate)) + why(fate.reason);
   }

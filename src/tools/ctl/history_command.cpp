@@ -20,7 +20,7 @@ namespace veltrad::ctl {
 
 namespace {
 
-int list(ControlClient& daemon, const Options& options) {
+int listHistory(ControlClient& daemon, const Options& options) {
   const auto items = askForHistory(daemon);
   if (!items) return refused(items.error());
   if (options.care.html) {
@@ -86,7 +86,7 @@ int runHistory(const Options& options) {
   if (!daemon) return refused(daemon.error());
   if (options.command == Command::historyShow) return show(daemon.value(), options);
   if (options.command == Command::historyPurge) return purge(daemon.value(), options);
-  return list(daemon.value(), options);
+  return listHistory(daemon.value(), options);
 }
 
 }  // namespace veltrad::ctl

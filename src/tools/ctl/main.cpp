@@ -12,6 +12,7 @@
 #include "tools/ctl/report_command.h"
 #include "tools/ctl/send_command.h"
 #include "tools/ctl/session_command.h"
+#include "tools/ctl/spool_command.h"
 #include "tools/ctl/stats_command.h"
 #include "tools/ctl/status_command.h"
 #include "tools/ctl/why_command.h"
@@ -59,6 +60,10 @@ int run(int argc, char** argv) {
     case Command::historyShow:
     case Command::historyPurge:
       return runHistory(options);
+    case Command::spool:
+    case Command::spoolSend:
+    case Command::spoolDrop:
+      return runSpool(options);
     case Command::session:
       return runSession(options, interrupt);
     default:

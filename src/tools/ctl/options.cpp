@@ -22,7 +22,7 @@ namespace {
 
 constexpr const char* kExpectedCommands =
     "expected session, send, one-shot, states, display-url, upload, upload-log-data, stats, status, "
-    "metrics, doctor, config, refresh, report, privacy, history, why or watch";
+    "metrics, doctor, config, refresh, report, spool, privacy, history, why or watch";
 
 // Arguments in text form.
 struct Texts {

@@ -53,6 +53,9 @@ enum class Command {
   history,
   historyShow,
   historyPurge,
+  spool,
+  spoolSend,
+  spoolDrop,
   why,
   watch
 };
@@ -72,6 +75,8 @@ struct Care {
   bool raw = false;
   // history: the page to write.
   std::optional<std::string> html;
+  // spool drop: the posts.
+  std::vector<std::string> ids;
   // why, watch.
   FateFilter fates;
   std::size_t last = 20;

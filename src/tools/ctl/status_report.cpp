@@ -117,6 +117,20 @@ void addServers(std::string& out, const Array& servers, double now) {
   }
 }
 
+void addSpool(std::string& out, const Dictionary& spool, double now) {
+  const auto oldest = real(spool, "oldest");
+  out += fmt::format("\n\nSpool\n  {} posts, {} bytes{}", numberIn(spool, "posts"), numberIn(spool, "bytes"),
+                     oldest ? ", the oldest " + formatDuration(now - *oldest) + " old" : "");
+  for (const Value& one : arrayIn(spool, "addresses")) {
+    const Dictionary* address = one.asDictionary();
+    if (!address) continue;
+    const double wait = real(*address, "nextTry").value_or(now) - now;
+    out += fmt::format("\n  {}: {} posts, last error: {}, next try {}", textIn(*address, "address", ""),
+                       numberIn(*address, "posts"), textIn(*address, "lastError", "none"),
+                       wait > 0 ? "in " + formatDuration(wait) : "now");
+  }
+}
+
 }  // namespace
 
 Array treeOfSessions(Array listed) {
@@ -156,6 +170,7 @@ std::string formatStatus(const Dictionary& status, double now) {
   }
   addStorebags(out, arrayIn(status, "storebags"), now);
   addServers(out, arrayIn(status, "servers"), now);
+  if (const Dictionary* spool = status.dictionary("spool")) addSpool(out, *spool, now);
   return out;
 }
 

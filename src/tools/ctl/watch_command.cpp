@@ -3,7 +3,7 @@
 #include <fmt/format.h>
 
 #include <chrono>
-#include <unordered_set>
+#include <set>
 
 #include "formats/json.h"
 #include "tools/ctl/contents_source.h"
@@ -33,7 +33,7 @@ class Watcher final : public support::FateReader::Listener {
   void taken(const support::ToldMessage& message) override {
     if (!message.session || !fits(_options.care.fates, message)) return;
     // Those with steps still to come. What is forgotten here is of messages long done.
-    if (_told.size() == kMostTold) _told.clear();
+    if (_told.size() == kMostTold) _told.erase(_told.begin());
     _told.insert(message.entry.message);
     if (!_printing) return;
     Dictionary line = lineOfMessage(message);
@@ -100,7 +100,7 @@ class Watcher final : public support::FateReader::Listener {
   std::uint64_t _lostContents = 0;
   bool _printing = false;
   bool _failed = false;
-  std::unordered_set<std::uint64_t> _told;
+  std::set<std::uint64_t> _told;
 };
 
 }  // namespace

@@ -82,7 +82,11 @@ Wrong readHeaders(const Value& value, Dictionary& into) {
   return std::nullopt;
 }
 
+Wrong readScript(const Value& value, std::vector<Rule>& into);
+
 Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
+  if (key == "script") return readScript(value, rule.script);
+  if (key == "forMs") return readInteger<std::chrono::milliseconds>(value, 1, 3'600'000, rule.lasts);
   if (key == "path") return readText(value, rule.path);
   if (key == "cut") return readBoolean(value, rule.cut);
   if (key == "cutHalfway") return readBoolean(value, rule.cutHalfway);
@@ -100,7 +104,25 @@ Wrong readEntry(const std::string& key, const Value& value, Rule& rule) {
   if (key == "delayMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.delay);
   if (key == "dripMs") return readInteger<std::chrono::milliseconds>(value, 0, 3'600'000, rule.drip);
   return "one of path, times, share, status, delayMs, dripMs, cut, cutHalfway, stall, endless, sign, "
-         "bag, ack, lastModified, headers, body";
+         "bag, ack, lastModified, headers, body, script, forMs";
+}
+
+// A request takes the first that has not ended; one without times or a time is for one request.
+Wrong readScript(const Value& value, std::vector<Rule>& into) {
+  const Array* steps = value.asArray();
+  if (!steps || steps->empty()) return "an array of rules without paths";
+  for (const Value& one : *steps) {
+    const Dictionary* entries = one.asDictionary();
+    if (!entries) return "an array of rules without paths";
+    Rule step;
+    for (const auto& [key, inner] : *entries) {
+      if (key == "path" || key == "script") return "an array of rules without paths";
+      if (const Wrong expected = readEntry(key, inner, step)) return "in \"" + key + "\" " + *expected;
+    }
+    if (!step.times && !step.lasts) step.times = 1;
+    into.push_back(std::move(step));
+  }
+  return std::nullopt;
 }
 
 }  // namespace
@@ -135,9 +157,30 @@ std::optional<Rule> Misbehaviour::take(std::string_view path) {
   }
   if (best == _rules.end()) return std::nullopt;
   if (best->share && static_cast<std::int64_t>(_draw() % 100) >= *best->share) return std::nullopt;
-  Rule taken = *best;
+  return applied(best);
+}
+
+// Removes what has ended.
+std::optional<Rule> Misbehaviour::applied(std::vector<Rule>::iterator rule) {
+  const auto now = std::chrono::steady_clock::now();
+  auto& script = rule->script;
+  const auto over = [now](Rule& one) {
+    if (one.lasts && !one.end) one.end = now + *one.lasts;
+    return one.end && *one.end <= now;
+  };
+  const bool scripted = !script.empty();
+  while (!script.empty() && over(script.front())) script.erase(script.begin());
+  if ((scripted && script.empty()) || over(*rule)) {
+    _rules.erase(rule);
+    return std::nullopt;
+  }
+  Rule& step = scripted ? script.front() : *rule;
+  Rule taken = step;
   taken.generation = _generation;
-  if (best->times && --*best->times == 0) _rules.erase(best);
+  if (step.times && --*step.times == 0) {
+    if (scripted) script.erase(script.begin());
+    if (script.empty()) _rules.erase(rule);
+  }
   return taken;
 }
 

@@ -17,8 +17,8 @@
 
 namespace veltrad::lab {
 
-// Its 17 fields are the keys of a rule (see `veltra-lab --help`) and the generation. A default changes
-// nothing.
+// Its 20 fields are the keys of a rule (see `veltra-lab --help`), when it ends, and the generation. A default
+// changes nothing.
 struct Rule {
   // wrong: one bit is inverted; missing: the container has no "signature"; none: the storebag without a
   // container.
@@ -50,6 +50,11 @@ struct Rule {
   std::optional<std::string> body;
   // Texts that replace headers of the same name.
   Dictionary headers;
+  // Applied in turn, each until its times or its time are over; then the rule has ended.
+  std::vector<Rule> script;
+  // How long the rule is applied, from the first request on.
+  std::optional<std::chrono::milliseconds> lasts;
+  std::optional<std::chrono::steady_clock::time_point> end;
   // The generation of the rules when take() returned this one.
   std::uint64_t generation = 0;
 };
@@ -78,6 +83,8 @@ class Misbehaviour {
   std::uint64_t generation() const;
 
  private:
+  std::optional<Rule> applied(std::vector<Rule>::iterator rule) REQUIRES(_mutex);
+
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::vector<Rule> _rules GUARDED_BY(_mutex);

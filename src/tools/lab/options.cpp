@@ -23,12 +23,15 @@ Prints one JSON line when it is ready, writes what arrives to DIR/received, and 
   POST   /events, /realtime, …   the event collector
   POST   /control                add a rule for misbehaviour: the body is JSON, see below. DELETE: remove all rules
   GET    /received?kind=events   what arrived, one JSON object per line. Also: storebags, dashboard, logdata, uploads
+  GET    /doubles                how often each X-VLT-Post-ID has come that has come more than once
   GET    /                       a page with the newest arrivals
 
 Keys of a rule: path (a prefix), times, share (per cent), status, delayMs, dripMs (pause between the bytes of
 the body), cut, cutHalfway, stall, endless, sign (wrong, missing, none), lastModified, headers, body (a text or
-{"$data": base64}). A redirect is a status and a header:
+{"$data": base64}), forMs (how long it is applied), script (an array of rules without paths, applied in turn, each
+to one request unless it has times or forMs). A redirect is a status and a header:
   {"path": "/events", "status": 302, "headers": {"Location": "/there"}}
+  {"path": "/events", "script": [{"status": 429, "headers": {"Retry-After": "2"}}, {"cut": true, "forMs": 5000}]}
 "bag" changes a storebag before it is signed, and its keys. It is an object of serial, expires, name, validFor
 (seconds after the clock, instead of expires), clock (a date and time instead of now), key (whose RSA key signs),
 ed25519 (an array: whose Ed25519 keys sign, too) and revoked (an array: whose keys, or fingerprints). Keys are

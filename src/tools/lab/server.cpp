@@ -12,6 +12,7 @@
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "page.h"
+#include "post_ids.h"
 #include "upload_digest.h"
 
 namespace veltrad::lab {
@@ -119,6 +120,7 @@ struct Server::Library {
   std::thread accepting;
   std::atomic<bool> failed{false};
   std::atomic<unsigned> storedLogData{0};
+  PostIDs postIDs;
 };
 
 bool Server::Library::useCertificate(SSL_CTX& context) {
@@ -152,6 +154,9 @@ void Server::Library::route() {
                                    "Dashboard: 127.0.0.1, UDP port " + std::to_string(lab.dashboardPort())},
                                   lab._arrivals),
                          "text/html; charset=utf-8");
+  });
+  http.Get("/doubles", [this](const Request&, Response& response) {
+    response.set_content(formats::writeJSON(postIDs.doubles()), "application/json");
   });
   http.Get("/received", [this](const Request& request, Response& response) { received(request, response); });
   http.Get("/.+", [this](const Request& request, Response& response) { storebag(request, response); });
@@ -208,6 +213,8 @@ void Server::Library::collect(const httplib::Request& request, httplib::Response
   answer.body = "{}";
   if (rule) applyRule(*rule, answer);
   Dictionary line = arrival(request);
+  if (const std::string id = request.get_header_value("X-VLT-Post-ID"); !id.empty())
+    line.set("double", postIDs.add(toUTF8(id)));
   const std::string length = request.get_header_value("Content-Length");
   line.set("compressed", request.get_header_value("Content-Encoding") == "gzip");
   line.set("bytes", length.empty() ? std::uint64_t{body.size()}

@@ -202,6 +202,12 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
     char field[backends::PacketText::kSize];
     backends::PacketText(field).append(payload);
     told.texts.emplace_back(field);
+    // Only the device knows its digests. They have decided where the field stands.
+    for (const std::string& key : edits.hashed) {
+      const std::string* digest = payload.string(key);
+      const std::size_t at = digest ? told.texts.back().find(*digest) : std::string::npos;
+      if (at != std::string::npos) told.texts.back().replace(at, digest->size(), "null");
+    }
   }
   return told;
 }

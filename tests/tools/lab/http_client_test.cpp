@@ -148,6 +148,33 @@ TEST_F(HTTPClientTest, AnswersAreBounded) {
   EXPECT_TRANSPORT_ERROR(client.perform(std::move(late)), HasSubstr("time"));
 }
 
+TEST_F(HTTPClientTest, SaysHowLongAServerAsksToWaitAlsoIfTheAnswerIsCut) {
+  const std::pair<const char*, std::chrono::seconds> headers[] = {{"7", 7s},
+                                                                  {"0", 0s},
+                                                                  {"-5", 0s},
+                                                                  {"soon", 0s},
+                                                                  {"99999999", 86'400s},
+                                                                  {"Wed, 21 Oct 2015 07:28:00 GMT", 0s},
+                                                                  {"Wed, 21 Oct 2065 07:28:00 GMT", 86'400s}};
+  for (const auto& [value, wait] : headers) {
+    const std::string rule =
+        std::string(R"({"path": "/", "status": 429, "headers": {"Retry-After": ")") + value + "\"}}";
+    const Server server({rule.c_str()});
+    http::HTTPRequest request = post(server.url("/x"), "");
+    request.sharedBody = std::make_shared<const std::string>("\"shared\"");
+    request.keepsAnswer = false;
+    const http::HTTPResult result = client.perform(std::move(request));
+    ASSERT_TRUE(result.ok());
+    EXPECT_EQ(result.value().retryAfter, wait) << value;
+    EXPECT_EQ(*server.requests()[0].string("body"), "shared");
+  }
+  const Server server(
+      {R"({"path": "/", "cutHalfway": true, "body": "12345678", "headers": {"Retry-After": "9"}})"});
+  const http::HTTPResult cut = client.perform(post(server.url("/x"), "{}"));
+  ASSERT_FALSE(cut.ok());
+  EXPECT_EQ(cut.error().retryAfter, 9s);
+}
+
 TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
   for (const bool started : {false, true}) {  // the HTTP thread
     for (const unsigned free : {0u, 2u}) {

@@ -1,0 +1,129 @@
+// SPDX-License-Identifier: Apache-2.0
+// Which posts are in the spool, which of them may leave when, and which have to queue behind them. No disk;
+// any thread.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "backends/https/spool_waits.h"
+#include "base/mutex.h"
+#include "http/http_client.h"
+#include "support/spool_index.h"
+
+namespace veltrad::platform {
+class Clock;
+}  // namespace veltrad::platform
+
+namespace veltrad::backends {
+
+// Of what is asked for an address. Its 11 fields are the places, the addresses, the posts under way and how
+// the spool stands.
+class SpoolQueue {
+ public:
+  using Name = support::SpoolFolder::Name;
+  using Place = support::SpoolPlace;
+
+  struct AddressStatus {
+    std::string address;
+    support::SpoolIndex::Amount amount;
+    double nextTry = 0;  // seconds since 1970; 0: at once
+    std::string lastError;
+  };
+  // A post that is made now.
+  struct Admission {
+    std::uint64_t order = 0;
+    std::uint64_t emptied = 0;  // how often the queue had been emptied
+    // Why it is to be kept at once, as one line; nothing: it may begin, and is under way until it has landed.
+    std::optional<std::string> refusal;
+  };
+
+  // The clock outlives it.
+  SpoolQueue(const platform::Clock& clock, const support::SpoolBounds& bounds, const SpoolPace& pace)
+      : _clock(clock), _pace(pace), _index(bounds) {}
+
+  // While the spool is being read every post is refused.
+  Admission admit(const std::string& address, std::uint32_t connection);
+  // It has ended, and the server has given an answer that is no reason to keep it; or there is no answer.
+  void landed(std::uint64_t order, const std::string& address, bool answered);
+  // It has ended so that it is kept.
+  void failed(const std::string& address, const http::HTTPResult& result);
+  // Takes a place in state `writing`, so that later ones of its connection queue behind it. False: the queue
+  // has been emptied since it was admitted.
+  bool add(Place place, const std::string& address, std::uint32_t uid, std::uint64_t emptied);
+  // What an earlier daemon has left. False: the queue has been emptied since.
+  bool addLoaded(Place place, const std::string& address, std::uint32_t uid, const std::string& lastError);
+  void allLoaded();
+  // False if the deadline passed first.
+  bool waitUntilLoaded(std::chrono::steady_clock::time_point deadline) const;
+
+  // The size of its file is known. False: it is not there any more.
+  bool setBytes(std::uint64_t order, std::uint32_t bytes);
+  // It is on disk.
+  bool written(std::uint64_t order);
+  bool holds(std::uint64_t order) const;
+  // As it was; nothing: it is not there.
+  std::optional<Place> takeOut(std::uint64_t order);
+  // The one that has to go, while there is too much.
+  std::optional<Name> excess(support::SpoolIndex::Excess& why) const;
+  // The oldest, if it was made before.
+  std::optional<Name> olderThan(std::uint64_t order) const;
+
+  // Posts that leave now. `next`: when to ask again, in seconds from now.
+  std::vector<Name> takeDue(double& next);
+  // One of these has ended so. Returns it as it is now; nothing: it was taken out meanwhile. It is taken out
+  // if it is not kept.
+  std::optional<Place> tried(std::uint64_t order, const http::HTTPResult& result);
+  // The network may be there again.
+  void woken();
+  // All leave now, but for the pace. Returns how many posts that are.
+  std::size_t hurry();
+  // What is under way is not kept when it fails. Returns the posts, which stay.
+  std::vector<Name> empty();
+  // Nothing leaves any more.
+  void stopSending();
+
+  // So many after this order, without those that are being written.
+  std::vector<Name> names(std::uint64_t after, std::size_t most) const;
+  std::optional<Name> named(const support::PostID& id) const;
+  std::optional<Place> place(std::uint64_t order, AddressStatus& address) const;
+  std::vector<AddressStatus> addresses() const;
+
+  // In seconds from now.
+  double waitAt(std::uint16_t address) const;
+  support::SpoolIndex::Amount amount() const;
+
+ private:
+  struct Flight {
+    std::uint64_t order = 0;
+    std::uint32_t connection = 0;
+    std::uint16_t address = 0;
+  };
+
+  double wallOffset() const;
+  std::uint16_t numberOf(const std::string& address) REQUIRES(_mutex);
+  void land(std::uint64_t order) REQUIRES(_mutex);
+  void remove(Place& place) REQUIRES(_mutex);
+  bool blocked(const Place& place) const REQUIRES(_mutex);
+  AddressStatus statusOf(std::uint16_t address) const REQUIRES(_mutex);
+
+  const platform::Clock& _clock;
+  const SpoolPace _pace;
+
+  mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  mutable support::SpoolIndex _index GUARDED_BY(_mutex);
+  // By the index's numbers of addresses.
+  std::vector<SpoolWait> _waits GUARDED_BY(_mutex);
+  std::vector<Flight> _underWay GUARDED_BY(_mutex);
+  std::uint64_t _lastOrder GUARDED_BY(_mutex) = 0;
+  std::uint64_t _emptied GUARDED_BY(_mutex) = 0;
+  bool _allLoaded GUARDED_BY(_mutex) = false;
+  bool _sends GUARDED_BY(_mutex) = true;
+  mutable Condition _loaded;
+};
+
+}  // namespace veltrad::backends

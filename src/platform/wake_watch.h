@@ -1,0 +1,34 @@
+// SPDX-License-Identifier: Apache-2.0
+// Notices that the network may be there again: a route has come, or the machine has woken. One thread.
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+
+#include "base/file_descriptor.h"
+
+namespace veltrad::platform {
+
+class WakeWatch {
+ public:
+  // Without a netlink socket only waking is noticed.
+  WakeWatch();
+
+  // To be polled for reading; negative: there is none.
+  int descriptor() const { return _routes.get(); }
+  // Whether a route has come, or the machine has slept, since the last call. Never blocks.
+  bool happened();
+
+ private:
+  bool routeCame();
+
+  FileDescriptor _routes;
+  // Of the clock that goes on while the machine sleeps, beyond the one that does not.
+  std::chrono::nanoseconds _slept;
+};
+
+// Whether netlink messages tell of a new route.
+bool tellsOfRoute(const char* messages, std::size_t size);
+
+}  // namespace veltrad::platform
