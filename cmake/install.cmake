@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-# What cmake --install puts where, by component: daemon, library, development, tools, lab, python. Everything is relative to
+# What cmake --install puts where, by component: daemon, library, development, tools, lab, gateway, python. Everything is relative to
 # the prefix, except that /usr has its configuration in /etc.
 include(CMakePackageConfigHelpers)
 
@@ -66,5 +66,12 @@ install(TARGETS veltractl veltra-storebag RUNTIME DESTINATION ${CMAKE_INSTALL_BI
 if(VELTRA_LAB)
   install(TARGETS veltra-lab RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT lab)
   veltra_install_unit(lab veltra-lab.service)
+endif()
+if(VELTRA_GATEWAY)
+  install(TARGETS veltra-gateway RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT gateway)
+  veltra_install_unit(gateway veltra-gateway.service)
+  veltra_install_unit(gateway veltra-gateway-drain.service)
+  install(FILES fleet/nginx.conf fleet/stream.conf fleet/postgresql.conf fleet/schema.sql fleet/README.md
+          DESTINATION ${CMAKE_INSTALL_DATADIR}/veltra-gateway COMPONENT gateway)
 endif()
 install(DIRECTORY python/veltra DESTINATION ${PYTHON_DIRECTORY} COMPONENT python PATTERN __pycache__ EXCLUDE)

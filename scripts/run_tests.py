@@ -2,6 +2,7 @@
 """Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals."""
 import os
 import re
+import shutil
 import subprocess
 import sys
 import time
@@ -64,6 +65,9 @@ def programs(preset):
     if preset in ("dev", "plain"):
         yield [sys.executable, "tests/must_not_compile/run.py"]
     yield [sys.executable, "tests/e2e/run.py"]
+    # Without the gateway or its servers (scripts/setup gateway) there is nothing to run.
+    if preset in ("dev", "plain") and (binaries / "veltra-gateway").exists() and shutil.which("nats-server"):
+        yield [sys.executable, "tests/fleet/run.py"]
 
 
 def test(preset):

@@ -16,7 +16,7 @@ import time
 from pathlib import Path
 
 SOURCE = Path(__file__).resolve().parents[2]
-PACKAGES = ["veltrad", "libveltra8", "libveltra-dev", "veltra-tools", "veltra-lab", "python3-veltra"]
+PACKAGES = ["veltrad", "libveltra8", "libveltra-dev", "veltra-tools", "veltra-lab", "veltra-gateway", "python3-veltra"]
 NEEDED = "systemd-sysv dbus gcc libc6-dev pkg-config curl logrotate"
 DEADLINE = 60
 

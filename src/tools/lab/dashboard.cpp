@@ -11,9 +11,14 @@
 #include <cerrno>
 #include <cstring>
 
-#include "dashboard_packet.h"
+#include "tools/dashboard_packet.h"
 
 namespace veltrad::lab {
+
+using tools::acknowledgementOf;
+using tools::asksForAcknowledgement;
+using tools::kPacketHeaderBytes;
+
 namespace {
 
 constexpr std::size_t kLargestDatagram = 65'536;
@@ -130,7 +135,7 @@ void Dashboard::receive() {
 
 void Dashboard::handle(const sockaddr_in& from, std::string_view datagram) {
   const Rule rule = _misbehaviour.take(kDashboardPath).value_or(Rule());
-  Dictionary line = fieldsOfPacket(datagram);
+  Dictionary line = tools::fieldsOfPacket(datagram);
   line.set("time", secondsNow());
   line.set("from", textOf(from));
   line.set("bytes", std::uint64_t{datagram.size()});

@@ -13,6 +13,7 @@
 #include "config/storebag_content.h"
 #include "storebag/options.h"
 #include "tools/ctl/options.h"
+#include "tools/gateway/options.h"
 #include "tools/lab/options.h"
 #include "tools/reference/command_pages.h"
 #include "tools/reference/completions.h"
@@ -41,6 +42,9 @@ constexpr Part kParts[] = {
     {"commands of veltra-storebag", [] { return commandsOf(storebag::commandLine()); }},
     {"description of veltra-lab", [] { return prose(lab::commandLine().about); }},
     {"options of veltra-lab", [] { return optionsOf(lab::commandLine()); }},
+    {"description of veltra-gateway", [] { return prose(gateway::commandLine().about); }},
+    {"options of veltra-gateway", [] { return optionsOf(gateway::commandLine()); }},
+    {"commands of veltra-gateway", [] { return commandsOf(gateway::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
     {"findings of lint", findings},
     {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},

@@ -76,20 +76,6 @@ std::optional<std::string> writeNew(const std::string& path, const std::string& 
   return path + ": could not be written";
 }
 
-// Why lint refuses the storebag; empty if it does not.
-std::string errorsIn(const StorebagDocument& bag) {
-  std::string lines;
-  std::size_t count = 0;
-  for (const Finding& finding : lintStorebag(bag)) {
-    if (kindOf(finding.name).severity != Severity::error) continue;
-    lines += "\n" + lineOf(bag.document.file, finding);
-    ++count;
-  }
-  if (count == 0) return "";
-  return fmt::format("{}: {} {}; --force signs it all the same{}", bag.document.file, count,
-                     count == 1 ? "error" : "errors", lines);
-}
-
 }  // namespace
 
 Outcome keygen(const std::string& directory, int bits, bool ed25519) {
@@ -121,7 +107,8 @@ Outcome sign(const SignRequest& request) {
   if (bag.value().signedContainer)
     return refused(request.in + ": is signed already; \"veltra-storebag show\" prints the storebag in it");
   if (!request.force) {
-    if (std::string errors = errorsIn(bag.value()); !errors.empty()) return refused(std::move(errors));
+    if (std::string errors = errorsIn(bag.value()); !errors.empty())
+      return refused(errors + "\n--force signs it all the same");
   }
   if (request.expires && !config::expiryOf(*request.expires))
     return refused(

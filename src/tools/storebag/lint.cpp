@@ -237,6 +237,18 @@ std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions
   return findings;
 }
 
+std::string errorsIn(const StorebagDocument& bag) {
+  std::string lines;
+  std::size_t count = 0;
+  for (const Finding& finding : lintStorebag(bag)) {
+    if (kindOf(finding.name).severity != Severity::error) continue;
+    lines += "\n" + lineOf(bag.document.file, finding);
+    ++count;
+  }
+  if (count == 0) return "";
+  return fmt::format("{}: {} {}{}", bag.document.file, count, count == 1 ? "error" : "errors", lines);
+}
+
 Finding findingOf(const DocumentFailure& failure) {
   return {syntax, failure.place.value_or(TextPlace{}), "", failure.detail, failure.mend};
 }

@@ -2,6 +2,7 @@
 // Finds mistakes in the content of a storebag.
 #pragma once
 
+#include <string>
 #include <vector>
 
 #include "storebag/document.h"
@@ -16,6 +17,8 @@ struct LintOptions {
 
 // All findings, in the order of their places.
 std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions& options = {});
+// The errors among them, one a line behind a line with their number; empty if there are none.
+std::string errorsIn(const StorebagDocument& bag);
 // Of a file that is no storebag.
 Finding findingOf(const DocumentFailure& failure);
 

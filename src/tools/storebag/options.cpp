@@ -25,7 +25,9 @@ Example, for a storebag quindle.json and devices that have keys/publicKey.der:
   veltra-storebag fmt --write quindle.json
   veltra-storebag lint quindle.json
   veltra-storebag sign --key keys/private.pem quindle.json -o quindle
-  veltra-storebag verify --key keys/publicKey.der quindle)";
+  veltra-storebag verify --key keys/publicKey.der quindle
+  veltra-storebag publish quindle /srv/bags
+  veltra-storebag rollback quindle /srv/bags)";
 
 CLI::App* addCommand(CLI::App& app, const char* name, const char* about) {
   return app.add_subcommand(name, about)->group("Commands");
@@ -81,6 +83,23 @@ void describeKeys(CLI::App& app, Arguments& given) {
       ->type_name("FILE");
   verify->add_option("FILE", given.file, "The container")->required();
   verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
+
+  CLI::App* publish = addCommand(
+      app, "publish", "Put signed storebags where a web server serves them, each under its file's name");
+  publish->positionals_at_end();  // the last one is DIR
+  publish->add_option("FILE", given.publish.files, "Signed containers")->required();
+  publish->add_option("DIR", given.publish.directory, "The folder that is served")->required();
+  publish->add_option("--key", given.publish.publicKey, "Public key in DER form that devices have")
+      ->type_name("FILE")
+      ->capture_default_str();
+  publish->callback([&given] { given.outcome = storebag::publish(given.publish); });
+
+  CLI::App* rollback = addCommand(app, "rollback", "Serve again what was published before");
+  rollback->positionals_at_end();
+  rollback->add_option("NAME", given.publish.files, "Names of storebags")->required();
+  rollback->add_option("DIR", given.publish.directory, "The folder that is served")->required();
+  rollback->callback(
+      [&given] { given.outcome = storebag::rollback(given.publish.files, given.publish.directory); });
 
   CLI::App* show = addCommand(app, "show", "Print a storebag as JSON, without verifying it");
   show->add_option("FILE", given.file, "A container or an unsigned storebag")->required();

@@ -6,6 +6,7 @@
 
 #include "config/storebag_signing.h"
 #include "storebag/commands.h"
+#include "storebag/publish.h"
 #include "tools/command_line.h"
 
 namespace veltrad::storebag {
@@ -16,6 +17,7 @@ struct Arguments {
   bool json = false;
   bool ed25519Key = false;
   SignRequest sign;
+  PublishRequest publish;
   LintRequest lint;
   FormatRequest format;
   ExplainRequest explain;

@@ -35,7 +35,7 @@ TEST(Pages, AreCurrent) {
     expectCurrent(entry.path(), page.value());
     ++pages;
   }
-  EXPECT_EQ(pages, 9u);
+  EXPECT_EQ(pages, 10u);
   for (const MadeFile& file : madeFiles()) expectCurrent(kSources / file.path, file.make());
 }
 

@@ -14,6 +14,7 @@
 #include "fakes/temporary_directory.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
+#include "storebag/publish.h"
 
 namespace veltrad {
 namespace {
@@ -95,6 +96,44 @@ TEST_F(StorebagCommands, VerifyNamesTheStepThatFails) {
   const std::string good = file("good", config::makeStorebagContainer(key.value(), kStorebag));
   EXPECT_TRUE(storebag::verify(publicKey, good).done);
   EXPECT_THAT(refusal(storebag::verify(privateKey, good)), HasSubstr("in DER form of 2048 to 8192 bits"));
+}
+
+TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
+  const auto signedBag = [this](const char* name, const Dictionary& more) {
+    Dictionary bag = kStorebag;
+    bag.merge(more);
+    file(std::string(name) + ".json", formats::writeJSON(bag));
+    EXPECT_TRUE(storebag::sign({privateKey, path(std::string(name) + ".json"), path(name), false}).done);
+    return path(name);
+  };
+  const auto publish = [this](const std::string& container) {
+    return storebag::publish({{container}, path("served"), publicKey});
+  };
+  const auto time = [this] { return std::filesystem::last_write_time(path("served/quindle")); };
+  ASSERT_TRUE(publish(signedBag("quindle", {{"serial", 4}})).done);
+  const std::string first = read("served/quindle");
+  const auto firstTime = time();
+  ASSERT_TRUE(publish(signedBag("quindle", {{"serial", 5}})).done);
+  EXPECT_GE(time(), firstTime + std::chrono::seconds(1)) << "a daemon that has the first would get 304";
+  const std::string second = read("served/quindle");
+  EXPECT_NE(first, second);
+
+  std::filesystem::create_directories(path("broken"));
+  std::string broken = second;
+  broken[broken.find("<key>signature</key>") + 40] ^= 1;
+  EXPECT_THAT(refusal(publish(file("broken/quindle", broken))), HasSubstr("signature"));
+  EXPECT_THAT(refusal(publish(signedBag("quindle", {{"serial", 4}}))), HasSubstr("serial 4 is lower than 5"));
+  EXPECT_THAT(refusal(publish(signedBag("quindle", {}))), HasSubstr("no serial"));
+  EXPECT_THAT(refusal(publish(signedBag("quindle", {{"serial", 6}, {"name", "ostvane"}}))),
+              HasSubstr("ostvane"));
+  EXPECT_EQ(read("served/quindle"), second);
+
+  const auto secondTime = time();
+  ASSERT_TRUE(storebag::rollback({"quindle"}, path("served")).done);
+  EXPECT_EQ(read("served/quindle"), first);
+  EXPECT_GE(time(), secondTime + std::chrono::seconds(1));
+  EXPECT_THAT(refusal(storebag::rollback({"quindle"}, path("served"))),
+              HasSubstr("nothing was published before"));
 }
 
 TEST_F(StorebagCommands, SignWritesWhatARolloutNeedsAndSignsTwice) {

@@ -1,12 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // Reads datagrams and makes acknowledgements.
-#include "dashboard_packet.h"
-
-#include <optional>
+#include "tools/dashboard_packet.h"
 
 #include "base/text.h"
 
-namespace veltrad::lab {
+namespace veltrad::tools {
 namespace {
 
 enum Offset : std::size_t {
@@ -79,21 +77,21 @@ Dictionary itemsOf(std::string_view text) {
   return items;
 }
 
-std::optional<std::string> problemOf(std::string_view packet) {
-  if (packet.size() > kMostPacketBytes) return "longer than " + std::to_string(kMostPacketBytes) + " bytes";
-  const unsigned length = ~number16(packet, invertedLength) & 0xffff;
-  if (length != packet.size())
-    return "says that it has " + std::to_string(length) + " bytes, has " + std::to_string(packet.size());
-  if (number8(packet, kind) != kMessageKind) return "its kind is not 1";
-  if (packet.find('\0', kPacketHeaderBytes) != std::string_view::npos) return "a NUL in its text";
+}  // namespace
+
+std::optional<std::string> problemOfPacket(std::string_view datagram) {
+  if (datagram.size() < kPacketHeaderBytes) return "shorter than the header of 64 bytes";
+  if (datagram.size() > kMostPacketBytes) return "longer than " + std::to_string(kMostPacketBytes) + " bytes";
+  const unsigned length = ~number16(datagram, invertedLength) & 0xffff;
+  if (length != datagram.size())
+    return "says that it has " + std::to_string(length) + " bytes, has " + std::to_string(datagram.size());
+  if (number8(datagram, kind) != kMessageKind) return "its kind is not 1";
   return std::nullopt;
 }
 
-}  // namespace
-
 Dictionary fieldsOfPacket(std::string_view datagram) {
   if (datagram.size() < kPacketHeaderBytes)
-    return {{"data", Data{std::string(datagram)}}, {"problem", "shorter than the header of 64 bytes"}};
+    return {{"data", Data{std::string(datagram)}}, {"problem", *problemOfPacket(datagram)}};
   const std::string_view device = datagram.substr(deviceID, kDeviceIDBytes);
   const std::string_view text = datagram.substr(kPacketHeaderBytes);
   const unsigned flagBits = number16(datagram, flags);
@@ -116,7 +114,10 @@ Dictionary fieldsOfPacket(std::string_view datagram) {
       {"text", toUTF8(text)},
       {"payload", itemsOf(text)},
   };
-  if (const auto problem = problemOf(datagram)) fields.set("problem", *problem);
+  if (const auto problem = problemOfPacket(datagram))
+    fields.set("problem", *problem);
+  else if (text.find('\0') != std::string_view::npos)
+    fields.set("problem", "a NUL in its text");
   return fields;
 }
 
@@ -131,4 +132,4 @@ std::string acknowledgementOf(std::string_view datagram, std::uint16_t eventOffs
   return header;
 }
 
-}  // namespace veltrad::lab
+}  // namespace veltrad::tools

@@ -1,0 +1,318 @@
+# SPDX-License-Identifier: Apache-2.0
+"""The other side on one machine: its parts as processes in one directory, which fleet.json there describes."""
+import contextlib
+import glob
+import json
+import os
+import pathlib
+import plistlib
+import pwd
+import re
+import shutil
+import signal
+import socket
+import subprocess
+import tempfile
+import time
+import urllib.request
+
+HERE = pathlib.Path(__file__).resolve().parent
+SOURCE = HERE.parent
+BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "release"))
+STREAMS = ["stream1", "stream2", "stream3"]
+GATEWAYS = ["gateway1", "gateway2"]
+NAMES = ["nginx", *STREAMS, *GATEWAYS, "drain", "postgres", "daemon"]
+START_ORDER = ["postgres", *STREAMS, *GATEWAYS, "drain", "nginx", "daemon"]
+DEADLINE = 60
+
+
+class Missing(Exception):
+    """A program is not installed."""
+
+
+def program(name):
+    """Of the build if it is there, else of the system."""
+    places = [BUILD / "bin" / name, pathlib.Path("/usr/libexec") / name, *map(pathlib.Path, glob.glob(f"/usr/lib/postgresql/*/bin/{name}")),
+              pathlib.Path("/usr/sbin") / name]
+    for place in places:
+        if place.exists():
+            return str(place)
+    if found := shutil.which(name):
+        return found
+    raise Missing(f"{name} is not installed; scripts/setup gateway installs what the fleet needs")
+
+
+def wait_until(condition, what, deadline=DEADLINE):
+    end = time.monotonic() + deadline
+    while not (value := condition()):
+        if time.monotonic() > end:
+            raise AssertionError(f"not within {deadline} s: {what}")
+        time.sleep(0.02)
+    return value
+
+
+def free_ports(count, kind=socket.SOCK_STREAM):
+    """Different ports that are free now."""
+    sockets = [socket.socket(socket.AF_INET, kind) for _ in range(count)]
+    for one in sockets:
+        one.bind(("127.0.0.1", 0))
+    ports = [one.getsockname()[1] for one in sockets]
+    for one in sockets:
+        one.close()
+    return ports
+
+
+def answers(url):
+    """Whether GET is answered with 200."""
+    with contextlib.suppress(OSError):
+        return urllib.request.urlopen(url, timeout=2).status == 200
+    return False
+
+
+def alive(pid):
+    try:
+        return pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()[0] != "Z"
+    except OSError:
+        return False
+
+
+def filled(name, values):
+    """The text of a configuration, with @NAME@ replaced."""
+    return re.sub(r"@([A-Z_]+)@", lambda found: str(values[found[1]]), (HERE / name).read_text())
+
+
+class Fleet:
+    """All parts. What start() needs to know stands in fleet.json, so that another process can start parts again."""
+
+    def __init__(self, path, facts):
+        self.path, self.facts = pathlib.Path(path), facts
+
+    @classmethod
+    def make(cls, **options):
+        """Makes the directory and everything that the parts read. Options: rate, maxAge, gateway and drain (further arguments)."""
+        path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-fleet-"))
+        path.chmod(0o755)
+        https, postgres, admin, *ports = free_ports(3 + 3 * len(STREAMS) + 2 * len(GATEWAYS))
+        facts = {"dir": str(path), "pids": {}, "https": https, "postgres": postgres, "drain": admin,
+                 "dashboard": free_ports(1, socket.SOCK_DGRAM)[0], "options": options,
+                 "streams": {name: ports[3 * at:3 * at + 3] for at, name in enumerate(STREAMS)},
+                 "gateways": {name: ports[9 + 2 * at:11 + 2 * at] for at, name in enumerate(GATEWAYS)}}
+        fleet = cls(path, facts)
+        fleet.configure()
+        fleet.save()
+        return fleet
+
+    @classmethod
+    def at(cls, path):
+        return cls(path, json.loads((pathlib.Path(path) / "fleet.json").read_text()))
+
+    def save(self):
+        new = self.path / "fleet.json.new"
+        new.write_text(json.dumps(self.facts))
+        new.rename(self.path / "fleet.json")
+
+    @property
+    def url(self):
+        return f"https://localhost:{self.facts['https']}"
+
+    @property
+    def dsn(self):
+        return f"host=127.0.0.1 port={self.facts['postgres']} user=veltra dbname=veltra"
+
+    def line(self):
+        """What those who use the fleet need, as one object."""
+        http = "http://127.0.0.1:{}".format
+        return {"dir": str(self.path), "url": self.url, "ca": str(self.path / "tls/certificate.pem"), "dsn": self.dsn,
+                "files": str(self.path / "files"), "dashboard": f"127.0.0.1:{self.facts['dashboard']}",
+                "gateways": [{"listen": http(listen), "admin": http(admin)} for listen, admin in self.facts["gateways"].values()],
+                "drain": http(self.facts["drain"]), "root": str(self.path / "root"), "bags": str(self.path / "bags"),
+                "parts": {name: self.facts["pids"][name] for name in NAMES if name in self.facts["pids"]}}
+
+    # What the parts read
+
+    def configure(self):
+        for name in ("tls", "nginx/www", "bags", "files", "logs", "postgres", *STREAMS):
+            (self.path / name).mkdir(parents=True)
+        for name in ("empty", "busy"):
+            (self.path / "nginx/www" / name).touch()
+        subprocess.run([program("openssl"), "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes",
+                        "-keyout", "tls/key.pem", "-out", "tls/certificate.pem", "-days", "30", "-subj", "/CN=localhost",
+                        "-addext", "subjectAltName=DNS:localhost,IP:127.0.0.1"],
+                       cwd=self.path, check=True, capture_output=True)
+        gateways = "\n".join(f"    server 127.0.0.1:{listen} max_fails=0;" for listen, _ in self.facts["gateways"].values())
+        options = self.facts["options"]
+        (self.path / "nginx/nginx.conf").write_text(filled("nginx.conf", {
+            "DIR": self.path, "LISTEN": f"127.0.0.1:{self.facts['https']}", "GATEWAYS": gateways,
+            "RATE": options.get("rate", "100000r/s"), "CONNECTIONS": 20000, "MAX_AGE": options.get("maxAge", 3600)}))
+        routes = ", ".join(f'"nats://127.0.0.1:{route}"' for _, _, route in self.facts["streams"].values())
+        for name, (port, monitor, route) in self.facts["streams"].items():
+            (self.path / name / "stream.conf").write_text(filled("stream.conf", {
+                "NAME": name, "PORT": port, "MONITOR": monitor, "ROUTE": route, "ROUTES": routes, "DIR": self.path, "STORE": "8GB"}))
+        self.make_database()
+        self.make_root()
+
+    def as_postgres(self, *command):
+        """PostgreSQL refuses to run as root."""
+        if os.getuid() != 0:
+            return list(command)
+        return [program("setpriv"), "--reuid=postgres", "--regid=postgres", "--init-groups", *command]
+
+    def make_database(self):
+        folder = self.path / "postgres"
+        if os.getuid() == 0:
+            os.chown(folder, pwd.getpwnam("postgres").pw_uid, pwd.getpwnam("postgres").pw_gid)
+        subprocess.run(self.as_postgres(program("initdb"), "-D", str(folder / "data"), "-U", "veltra", "--auth=trust",
+                                        "--encoding=UTF8", "--locale=C.UTF-8", "--no-instructions"),
+                       check=True, capture_output=True, cwd="/")
+        with (folder / "data/postgresql.conf").open("a") as file:
+            file.write(filled("postgresql.conf", {"PORT": self.facts["postgres"], "DIR": self.path}))
+
+    def make_root(self):
+        root = self.path / "root"
+
+        def write(name, content):
+            path = root / name
+            path.parent.mkdir(parents=True, exist_ok=True)
+            path.write_bytes(content if isinstance(content, bytes) else plistlib.dumps(content))
+        rights = {"com.florn.private.veltrad": True, "com.florn.veltrad.observe": True, "com.florn.veltrad.control": True}
+        write("etc/veltrad/entitlements.plist", [{"uid": os.getuid(), "entitlements": rights}])
+        write("etc/veltrad/ca.pem", (self.path / "tls/certificate.pem").read_bytes())
+        write("var/lib/veltrad/preferences/com.florn.veltra.plist",
+              {"veltra_storebag_url": self.url + "/bags/maple", "environmentType": 4, "DiagnosticLogSubmissionEnabled": True})
+        keys = self.path / "keys"
+        subprocess.run([program("veltra-storebag"), "keygen", str(keys)], check=True, capture_output=True)
+        write("usr/share/veltra/publicKey.der", (keys / "publicKey.der").read_bytes())
+
+    def publish(self, name, text):
+        """Signs a storebag (JSON, with the lab's placeholders) and puts it where nginx serves it."""
+        text = text.replace('"${dashboardPort}"', str(self.facts["dashboard"])).replace("${url}", self.url)
+        source = self.path / f"{name}.json"
+        source.write_text(text)
+        for command in (["sign", "--key", "keys/private.pem", str(source), "-o", name],
+                        ["publish", "--key", "keys/publicKey.der", name, "bags"]):
+            done = subprocess.run([program("veltra-storebag"), *command], cwd=self.path, capture_output=True, text=True)
+            if done.returncode != 0:
+                raise AssertionError(done.stdout + done.stderr)
+
+    # The parts
+
+    def command(self, name):
+        servers = [word for port, _, _ in self.facts["streams"].values() for word in ("--server", f"nats://127.0.0.1:{port}")]
+        if name == "nginx":
+            return [program("nginx"), "-e", str(self.path / "nginx/error.log"), "-c", str(self.path / "nginx/nginx.conf"), "-g", "daemon off;"]
+        if name in STREAMS:
+            return [program("nats-server"), "-c", str(self.path / name / "stream.conf")]
+        if name in GATEWAYS:
+            listen, admin = self.facts["gateways"][name]
+            return [program("veltra-gateway"), *servers, "--listen", f"127.0.0.1:{listen}", "--admin", f"127.0.0.1:{admin}",
+                    "--dashboard", f"127.0.0.1:{self.facts['dashboard']}", *self.facts["options"].get("gateway", [])]
+        if name == "drain":
+            return [program("veltra-gateway"), "drain", *servers, "--admin", f"127.0.0.1:{self.facts['drain']}",
+                    "--database", self.dsn, "--files", str(self.path / "files"), *self.facts["options"].get("drain", [])]
+        if name == "postgres":
+            return self.as_postgres(program("postgres"), "-D", str(self.path / "postgres/data"))
+        return [program("veltrad")]
+
+    def begin(self, name):
+        environment = {key: value for key, value in os.environ.items() if not key.startswith("VELTRA_") and key != "NOTIFY_SOCKET"}
+        if name == "daemon":
+            environment.update(VELTRA_ROOT=str(self.path / "root"), VELTRA_LOG_TARGET="stderr", LANG="en_US.UTF-8")
+        with (self.path / "logs" / f"{name}.log").open("ab") as log:
+            started = subprocess.Popen(self.command(name), stdin=subprocess.DEVNULL, stdout=log, stderr=log, cwd="/",
+                                       env=environment, start_new_session=True)
+        self.facts["pids"][name] = started.pid
+        self.save()
+        return started
+
+    def is_ready(self, name):
+        if name == "nginx":
+            return connects(self.facts["https"])
+        if name in STREAMS:
+            return answers(f"http://127.0.0.1:{self.facts['streams'][name][1]}/healthz")
+        if name in GATEWAYS:
+            return answers(f"http://127.0.0.1:{self.facts['gateways'][name][1]}/ready")
+        if name == "drain":
+            return answers(f"http://127.0.0.1:{self.facts['drain']}/ready")
+        if name == "postgres":
+            return subprocess.run([program("pg_isready"), "-q", "-d", self.dsn], capture_output=True).returncode == 0
+        return (self.path / "root/run/veltrad/com.florn.veltrad.sock").exists()
+
+    def start(self, names):
+        """Starts the parts that do not run, and waits until all given are ready."""
+        children = {}
+
+        def ready(name):
+            child = children.get(name)
+            if child and child.poll() is not None or not alive(self.facts["pids"].get(name, -1)):
+                # Also what a killed server has left may have to end first.
+                children[name] = self.begin(name)
+                time.sleep(0.1)
+            return self.is_ready(name)
+        names = [name for name in START_ORDER if name in names]
+        if "daemon" in names and not alive(self.facts["pids"].get("daemon", -1)):
+            (self.path / "root/run/veltrad/com.florn.veltrad.sock").unlink(missing_ok=True)
+        # The servers of the stream wait for each other.
+        for group in ([n for n in names if n == "postgres" or n in STREAMS], [n for n in names if n not in ("postgres", *STREAMS)]):
+            for name in group:
+                if not alive(self.facts["pids"].get(name, -1)):
+                    children[name] = self.begin(name)
+            for name in group:
+                wait_until(lambda: ready(name), f"{name} is ready; its log is {self.path}/logs/{name}.log")
+                if name == "postgres":
+                    self.make_tables()
+        return children
+
+    def make_tables(self):
+        known = subprocess.run([program("psql"), "-Atqc", "SELECT 1 FROM pg_database WHERE datname = 'veltra'",
+                                self.dsn.replace("dbname=veltra", "dbname=postgres")], capture_output=True, text=True)
+        if known.stdout.strip() != "1":
+            subprocess.run([program("createdb"), "-h", "127.0.0.1", "-p", str(self.facts["postgres"]), "-U", "veltra", "veltra"],
+                           check=True, capture_output=True)
+
+    def query(self, sql):
+        """The rows of a query, as lists of texts."""
+        done = subprocess.run([program("psql"), "-AtqX", "-F", "\x1f", "-c", sql, self.dsn], capture_output=True, text=True)
+        if done.returncode != 0:
+            raise AssertionError(done.stderr)
+        return [line.split("\x1f") for line in done.stdout.split("\n")[:-1]]
+
+    def table(self, sql):
+        """The same as psql shows it."""
+        return subprocess.run([program("psql"), "-qX", "-c", sql, self.dsn], capture_output=True, text=True).stdout
+
+    def is_carried(self):
+        """Whether the tables hold everything that the stream has taken."""
+        last = 0
+        for _, monitor, _ in self.facts["streams"].values():
+            with contextlib.suppress(OSError):
+                facts = json.load(urllib.request.urlopen(f"http://127.0.0.1:{monitor}/jsz?accounts=1&streams=1", timeout=2))
+                streams = [stream for account in facts.get("account_details", []) for stream in account.get("stream_detail", [])]
+                last = max([last, *(stream["state"]["last_seq"] for stream in streams if stream["name"] == "VELTRA")])
+        return last > 0 and self.query("SELECT seq FROM veltra.position") == [[str(last)]]
+
+    def kill(self, name, number=signal.SIGKILL):
+        with contextlib.suppress(ProcessLookupError):
+            os.kill(self.facts["pids"][name], number)
+
+    def stop(self):
+        """Ends every part, those first that send to the others."""
+        self.facts = Fleet.at(self.path).facts
+        for name in reversed(START_ORDER):
+            pid = self.facts["pids"].get(name)
+            if not pid or not alive(pid):
+                continue
+            self.kill(name, signal.SIGINT if name == "postgres" else signal.SIGTERM)
+            with contextlib.suppress(AssertionError):
+                wait_until(lambda: not alive(pid), f"{name} ends", 20)
+            if alive(pid):
+                self.kill(name)
+
+    def remove(self):
+        shutil.rmtree(self.path, ignore_errors=True)
+
+
+def connects(port):
+    with contextlib.suppress(OSError):
+        socket.create_connection(("127.0.0.1", port), 1).close()
+        return True
+    return False

@@ -1,0 +1,59 @@
+// SPDX-License-Identifier: Apache-2.0
+// The door for dashboards' datagrams, on a thread of its own. A datagram is acknowledged when the stream has
+// taken it.
+#pragma once
+
+#include <netinet/in.h>
+
+#include <atomic>
+#include <memory>
+#include <string>
+#include <string_view>
+
+#include "base/file_descriptor.h"
+#include "base/result.h"
+#include "base/thread.h"
+#include "gateway/publisher.h"
+
+namespace veltrad::gateway {
+
+// The datagram as the stream's message has it: a JSON object, and an ID that is the same whenever it is sent.
+Message messageOfDatagram(std::string_view datagram);
+
+class DatagramDoor {
+ public:
+  // The publisher and the metrics must outlive it.
+  DatagramDoor(Publisher& publisher, Metrics& metrics) : _publisher(publisher), _metrics(metrics) {}
+  ~DatagramDoor() { stop(); }
+
+  // Binds to "ADDRESS:PORT" (IPv4), which other gateways may share, and serves. Returns the address with the
+  // port that was given for port 0.
+  Result<std::string, std::string> start(const std::string& address);
+  // Takes nothing any more. What the stream takes later is still acknowledged.
+  void stop();
+
+ private:
+  // Outlives the door where completions still hold it.
+  struct Socket {
+    FileDescriptor descriptor;
+    std::atomic<int> underWay{0};
+  };
+  // Whom to answer, and from which of the machine's addresses.
+  struct Sender {
+    sockaddr_in from{};
+    in_addr at{};
+  };
+
+  void run();
+  bool receive(char* room, std::size_t size);
+  void handle(const Sender& sender, std::string_view datagram);
+  static void acknowledge(const Socket& socket, const Sender& sender, std::string header);
+
+  Publisher& _publisher;
+  Metrics& _metrics;
+  std::shared_ptr<Socket> _socket = std::make_shared<Socket>();
+  FileDescriptor _stopping;
+  Thread _thread;
+};
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,81 @@
+// SPDX-License-Identifier: Apache-2.0
+// The door for devices' requests: which path takes what, and who takes the body.
+#pragma once
+
+#include <atomic>
+#include <map>
+#include <memory>
+#include <string>
+#include <variant>
+
+#include "base/result.h"
+#include "gateway/http_server.h"
+#include "gateway/publisher.h"
+#include "gateway/refusals.h"
+
+namespace veltrad::gateway {
+
+// Of bodies, in bytes.
+struct BodyBounds {
+  // Events, packed and unpacked; log data.
+  std::uint64_t events = 16u << 20;
+  std::uint64_t logData = 32u << 20;
+  std::uint64_t packedFile = std::uint64_t{2} << 30;
+  std::uint64_t unpackedFile = std::uint64_t{4} << 30;
+  // All that is being received.
+  std::uint64_t together = 256u << 20;
+};
+
+// Bytes that are being received. Any thread.
+class ByteBudget {
+ public:
+  explicit ByteBudget(std::uint64_t most) : _most(most) {}
+  bool take(std::uint64_t bytes);
+  void give(std::uint64_t bytes) { _taken.fetch_sub(bytes, std::memory_order_relaxed); }
+
+ private:
+  const std::uint64_t _most;
+  std::atomic<std::uint64_t> _taken{0};
+};
+
+// What those who take bodies use. All of it must outlive them.
+struct DoorServices {
+  Publisher& publisher;
+  Metrics& metrics;
+  Refusals& refusals;
+  ByteBudget& budget;
+  BodyBounds bounds;
+};
+
+enum class Place { events, upload, logData };
+// What a request wants, decided from its head alone.
+struct Wanted {
+  Place place;
+  std::string path;
+  // The label behind "/events/".
+  std::string via;
+  // X-VLT-Post-ID; empty if the device has sent none.
+  std::string postID;
+  // Decoded parameters.
+  std::map<std::string, std::string> query;
+  bool packed = false;
+};
+Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds);
+
+// On the server's thread.
+class Door {
+ public:
+  Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed)
+      : _refusals(publisher, metrics, shed),
+        _budget(bounds.together),
+        _services{publisher, metrics, _refusals, _budget, bounds} {}
+
+  std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
+
+ private:
+  Refusals _refusals;
+  ByteBudget _budget;
+  const DoorServices _services;
+};
+
+}  // namespace veltrad::gateway

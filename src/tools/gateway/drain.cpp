@@ -1,0 +1,208 @@
+// SPDX-License-Identifier: Apache-2.0
+// Begins anew after every error: with the connections, and with the position that the database has.
+#include "gateway/drain.h"
+
+#include <unistd.h>
+
+#include <cstdio>
+#include <ctime>
+
+#include "gateway/admin.h"
+#include "gateway/metrics.h"
+#include "gateway/serve.h"
+#include "platform/limited_line.h"
+#include "platform/log.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+constexpr std::size_t kDrainStackBytes = 1u << 20;
+constexpr std::chrono::milliseconds kBetweenTries{500};
+constexpr std::chrono::hours kBetweenForgettings{1};
+constexpr std::chrono::seconds kBetweenPurges{1};
+
+std::int64_t nowNanoseconds() {
+  timespec now{};
+  ::clock_gettime(CLOCK_REALTIME, &now);
+  return std::int64_t{now.tv_sec} * 1'000'000'000 + now.tv_nsec;
+}
+
+}  // namespace
+
+void PurgePlan::reached(std::uint64_t seq, Time now) {
+  // One place a second is precise enough.
+  if (!_reached.empty() && now - _reached.back().first < kBetweenPurges && _reached.size() > 1)
+    _reached.back().second = seq;
+  else
+    _reached.emplace_back(now, seq);
+}
+
+std::optional<std::uint64_t> PurgePlan::due(Time now) {
+  std::optional<std::uint64_t> seq;
+  while (!_reached.empty() && now - _reached.front().first >= _after) {
+    seq = _reached.front().second;
+    _reached.pop_front();
+  }
+  return seq;
+}
+
+std::string DrainCounts::text() const {
+  std::string text = counterText("veltra_drain_events", "Events written to the tables.", events);
+  text += counterText("veltra_drain_messages", "Messages read from the stream and written.", messages);
+  text += counterText("veltra_drain_skipped", "Posts that the tables had already.", skipped);
+  text +=
+      counterText("veltra_drain_refused", "Messages that no table takes, now in veltra.refused.", refused);
+  text += counterText("veltra_drain_restarts", "How often it began anew after an error.", restarts);
+  text += gaugeText("veltra_drain_lag_messages", "Messages in the stream that were not read yet.",
+                    static_cast<double>(behind));
+  const std::int64_t last = lastTime;
+  const double lag = behind > 0 && last > 0 ? static_cast<double>(nowNanoseconds() - last) / 1e9 : 0;
+  text += gaugeText("veltra_drain_lag_seconds",
+                    "Age of the last message that was written, if there are more.", lag);
+  return text + kEndOfMetrics;
+}
+
+Drain::Drain(StreamOptions stream, DrainArguments given)
+    : _stream(std::move(stream)),
+      _given(std::move(given)),
+      _files(_given.files),
+      _purges(std::chrono::duration<double>(_given.purgeAfter)) {}
+
+Result<Done, std::string> Drain::start() {
+  if (auto opened = _files.open(); !opened) return Failure{"--files " + opened.error().detail};
+  if (!_thread.start("drain", kDrainStackBytes, [this] { run(); }))
+    return Failure{std::string("a thread cannot be started")};
+  return Done();
+}
+
+void Drain::stop() {
+  {
+    const Lock hold(_mutex);
+    _stopping = true;
+  }
+  _changed.notifyAll();
+  _thread.join();
+}
+
+bool Drain::stopping() {
+  const Lock hold(_mutex);
+  return _stopping;
+}
+
+bool Drain::pause(std::chrono::milliseconds time) {
+  const Lock hold(_mutex);
+  if (!_stopping) _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + time);
+  return !_stopping;
+}
+
+void Drain::run() {
+  platform::LimitedLine failures("failures");
+  while (!stopping()) {
+    const std::string why = runOnce();
+    _counts.active = false;
+    if (why.empty()) continue;
+    ++_counts.restarts;
+    if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
+    pause(kBetweenTries);
+  }
+}
+
+std::string Drain::runOnce() {
+  auto database = Database::open(_given.database);
+  if (!database) return database.error().detail;
+  auto active = TableWriter::becomeActive(*database.value());
+  if (!active) return active.error().detail;
+  if (!active.value()) {
+    logInfo("drain: another drain is active; waiting");
+    while (!active.value()) {
+      if (!pause(kBetweenTries)) return "";
+      active = TableWriter::becomeActive(*database.value());
+      if (!active) return active.error().detail;
+    }
+  }
+  if (auto prepared = TableWriter::prepare(*database.value()); !prepared) return prepared.error().detail;
+  auto reader = StreamReader::open(_stream);
+  if (!reader) return reader.error();
+  TableWriter writer(std::move(database).value(), _files, _stream.name);
+  return carry(*reader.value(), writer);
+}
+
+std::string Drain::carry(StreamReader& reader, TableWriter& writer) {
+  auto state = reader.state();
+  while (!state && pause(kBetweenTries)) state = reader.state();
+  if (!state) return "";
+  const auto position = writer.position(state.value().created);
+  if (!position) return position.error().detail;
+  _reached = position.value();
+  _silentAt = 0;
+  // The places of a stream that was there before mean nothing in this one.
+  _purges = PurgePlan(std::chrono::duration<double>(_given.purgeAfter));
+  if (_reached > 0) _purges.reached(_reached, std::chrono::steady_clock::now());
+  if (auto begun = reader.startBehind(_reached); !begun) return begun.error();
+  logInfo("drain: reads %s behind %llu", _stream.name.c_str(), static_cast<unsigned long long>(_reached));
+  _counts.active = true;
+  while (!stopping()) {
+    const auto messages = reader.read(_given.batch);
+    if (!messages) return messages.error();
+    _counts.behind = reader.behind();
+    if (messages.value().empty()) {
+      if (std::string why = lookAgain(reader, state.value().created); !why.empty()) return why;
+    } else {
+      const auto written = writer.write(messages.value());
+      if (!written) return written.error().detail;
+      _reached = messages.value().back().seq;
+      _counts.events += written.value().events;
+      _counts.messages += messages.value().size();
+      _counts.skipped += written.value().skipped;
+      _counts.refused += written.value().refused;
+      _counts.lastTime = messages.value().back().time;
+      _purges.reached(_reached, std::chrono::steady_clock::now());
+    }
+    keepHouse(reader, writer);
+  }
+  return "";
+}
+
+// Nothing came. A consumer that went with its server says nothing either, so the stream is asked.
+std::string Drain::lookAgain(StreamReader& reader, std::int64_t created) {
+  const auto state = reader.state();
+  if (!state) return state.error();
+  if (state.value().created != created) return "the stream was made anew";
+  const bool goesOn = state.value().lastSeq > _reached && state.value().firstSeq <= state.value().lastSeq;
+  // The first time a message may just be on its way.
+  const bool silentBefore = std::exchange(_silentAt, goesOn ? _reached + 1 : 0) == _reached + 1;
+  return goesOn && silentBefore ? "the consumer delivers nothing" : "";
+}
+
+void Drain::keepHouse(StreamReader& reader, TableWriter& writer) {
+  const auto now = std::chrono::steady_clock::now();
+  if (const auto seq = _purges.due(now)) {
+    if (auto purged = reader.purge(*seq); !purged) logWarning("drain: %s", purged.error().c_str());
+  }
+  if (now < _nextForgetting) return;
+  _nextForgetting = now + kBetweenForgettings;
+  if (auto forgotten = writer.forget(_given.postDays, _given.keepDays); !forgotten)
+    logWarning("drain: nothing was forgotten: %s", forgotten.error().detail.c_str());
+}
+
+int drain(const Arguments& given) {
+  blockStopSignals();
+  Drain carrying(streamOptions(given.stream), given.drain);
+  const DrainCounts& counts = carrying.counts();
+  Admin admin({[&counts] { return counts.active ? "" : "it does not read the stream"; },
+               [&counts] { return counts.text(); }});
+  const auto looked = admin.start(given.drain.admin);
+  const auto started = looked ? carrying.start() : Result<Done, std::string>(Done());
+  if (!looked || !started) {
+    std::fprintf(stderr, "veltra-gateway: %s\n",
+                 looked ? started.error().c_str() : ("--admin " + looked.error()).c_str());
+    return 1;
+  }
+  sayReady({{"admin", "http://" + looked.value()}, {"pid", static_cast<long>(::getpid())}});
+  awaitStop();
+  carrying.stop();
+  return 0;
+}
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,90 @@
+// SPDX-License-Identifier: Apache-2.0
+// Carries messages from the stream to the tables, on a thread of its own, until it is stopped.
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <deque>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "base/mutex.h"
+#include "base/thread.h"
+#include "gateway/options.h"
+#include "gateway/piece_store.h"
+#include "gateway/stream_reader.h"
+#include "gateway/table_writer.h"
+
+namespace veltrad::gateway {
+
+// What the stream may forget: places that were reached long enough ago. Decides from times alone.
+class PurgePlan {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+
+  explicit PurgePlan(std::chrono::duration<double> after) : _after(after) {}
+
+  // Everything up to `seq` is in the tables.
+  void reached(std::uint64_t seq, Time now);
+  // Up to where the stream may forget now; absent: nothing new.
+  std::optional<std::uint64_t> due(Time now);
+
+ private:
+  std::chrono::duration<double> _after;
+  std::deque<std::pair<Time, std::uint64_t>> _reached;
+};
+
+struct DrainCounts {
+  std::atomic<std::uint64_t> events{0};
+  std::atomic<std::uint64_t> messages{0};
+  std::atomic<std::uint64_t> skipped{0};
+  std::atomic<std::uint64_t> refused{0};
+  std::atomic<std::uint64_t> restarts{0};
+  std::atomic<std::uint64_t> behind{0};
+  // Of the last message that was written; nanoseconds since 1970.
+  std::atomic<std::int64_t> lastTime{0};
+  std::atomic<bool> active{false};
+
+  std::string text() const;
+};
+
+class Drain {
+ public:
+  Drain(StreamOptions stream, DrainArguments given);
+  ~Drain() { stop(); }
+
+  // The error says what the operator must mend: the folder of files.
+  Result<Done, std::string> start();
+  // After the batch that is being written.
+  void stop();
+  const DrainCounts& counts() const { return _counts; }
+
+ private:
+  void run();
+  // From its connections to the first error, or the stop; the error is one line.
+  std::string runOnce();
+  std::string carry(StreamReader& reader, TableWriter& writer);
+  std::string lookAgain(StreamReader& reader, std::int64_t created);
+  void keepHouse(StreamReader& reader, TableWriter& writer);
+  bool stopping();
+  bool pause(std::chrono::milliseconds time);
+
+  const StreamOptions _stream;
+  const DrainArguments _given;
+  PieceStore _files;
+  DrainCounts _counts;
+  // Of the stream that is being read.
+  PurgePlan _purges;
+  std::chrono::steady_clock::time_point _nextForgetting{};
+  std::uint64_t _reached = 0;
+  // Where nothing came although the stream goes on; 0: nowhere.
+  std::uint64_t _silentAt = 0;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  Condition _changed;
+  bool _stopping GUARDED_BY(_mutex) = false;
+  Thread _thread;
+};
+
+}  // namespace veltrad::gateway

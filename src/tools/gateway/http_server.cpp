@@ -1,0 +1,179 @@
+// SPDX-License-Identifier: Apache-2.0
+// Accepts connections, with Boost.Beast, which only this file and http_connection.cpp include.
+#include "gateway/http_server.h"
+
+#include <unistd.h>
+
+#include <atomic>
+#include <charconv>
+#include <cstring>
+#include <set>
+
+#include "gateway/http_connection.h"
+#include "platform/limited_line.h"
+#include "platform/log.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+// How long no connection is accepted while descriptors or memory are short.
+constexpr std::chrono::milliseconds kShortagePause{100};
+
+struct HostAndPort {
+  std::string host;
+  std::uint16_t port = 0;
+};
+
+std::optional<HostAndPort> hostAndPortOf(const std::string& address) {
+  const std::size_t colon = address.rfind(':');
+  if (colon == std::string::npos) return std::nullopt;
+  HostAndPort found{address.substr(0, colon), 0};
+  const char* end = address.data() + address.size();
+  const auto read = std::from_chars(address.data() + colon + 1, end, found.port);
+  if (read.ec != std::errc() || read.ptr != end) return std::nullopt;
+  if (found.host.starts_with('[') && found.host.ends_with(']'))
+    found.host = found.host.substr(1, found.host.size() - 2);
+  return found;
+}
+
+}  // namespace
+
+struct HTTPServer::Library : HTTPConnection::Owner {
+  Library(Handler given, Bounds given_bounds)
+      : HTTPConnection::Owner{std::move(given), given_bounds}, acceptor(context), pause(context) {}
+
+  void accept();
+  void accepted(const boost::system::error_code& error, Socket socket);
+  void closed(HTTPConnection& connection) override;
+  void stopNow();
+
+  // One thread runs the context, so nothing here is locked. The context is destroyed before what its
+  // connections use.
+  std::string path;
+  std::set<HTTPConnection*> connections;
+  std::atomic<std::size_t> count{0};
+  std::function<void()> stopped;
+  platform::LimitedLine shortages{"failures"};
+  boost::asio::io_context context{1};
+  boost::asio::basic_socket_acceptor<boost::asio::generic::stream_protocol> acceptor;
+  boost::asio::steady_timer pause;
+};
+
+void HTTPServer::Library::accept() {
+  if (stopping || connections.size() >= bounds.connections) return;
+  acceptor.async_accept(
+      [this](const boost::system::error_code& error, Socket socket) { accepted(error, std::move(socket)); });
+}
+
+void HTTPServer::Library::accepted(const boost::system::error_code& error, Socket socket) {
+  if (stopping) return;
+  if (error) {
+    if (const auto line = shortages.happened("http: a connection was not accepted: " + error.message()))
+      logWarning("%s", line->c_str());
+    pause.expires_after(kShortagePause);
+    pause.async_wait([this](const boost::system::error_code& cancelled) {
+      if (!cancelled) accept();
+    });
+    return;
+  }
+  boost::system::error_code ignored;
+  socket.set_option(boost::asio::ip::tcp::no_delay(true), ignored);
+  // The last to hold it may be another thread.
+  const std::shared_ptr<HTTPConnection> connection(
+      new HTTPConnection(*this, std::move(socket)), [this](HTTPConnection* last) {
+        boost::asio::dispatch(context, [owned = std::unique_ptr<HTTPConnection>(last)] {});
+      });
+  connections.insert(connection.get());
+  count = connections.size();
+  connection->start();
+  accept();
+}
+
+void HTTPServer::Library::closed(HTTPConnection& connection) {
+  const bool wasFull = connections.size() >= bounds.connections;
+  connections.erase(&connection);
+  count = connections.size();
+  if (stopping && connections.empty() && stopped) return std::exchange(stopped, nullptr)();
+  if (wasFull) accept();
+}
+
+void HTTPServer::Library::stopNow() {
+  stopping = true;
+  boost::system::error_code ignored;
+  acceptor.close(ignored);
+  pause.cancel();
+  if (!path.empty()) ::unlink(path.c_str());
+  if (connections.empty()) return stopped ? std::exchange(stopped, nullptr)() : void();
+  // Closing changes the set.
+  const std::vector<HTTPConnection*> open(connections.begin(), connections.end());
+  for (HTTPConnection* connection : open) connection->closeIfIdle();
+}
+
+HTTPServer::HTTPServer(Handler handler, Bounds bounds)
+    : _library(std::make_unique<Library>(std::move(handler), bounds)) {}
+
+HTTPServer::~HTTPServer() {
+  // Connections end without a word, with the context's handlers.
+  _library->stopping = true;
+  _library->stopped = nullptr;
+}
+
+Result<std::string, std::string> HTTPServer::listen(const std::string& address) {
+  namespace asio = boost::asio;
+  asio::generic::stream_protocol::endpoint endpoint;
+  std::string host;
+  if (address.starts_with("unix:")) {
+    _library->path = address.substr(5);
+    if (_library->path.empty() || _library->path.size() >= sizeof(sockaddr_un::sun_path))
+      return Failure{address + ": a socket's path has 1 to 107 bytes"};
+    ::unlink(_library->path.c_str());
+    endpoint = asio::local::stream_protocol::endpoint(_library->path);
+  } else {
+    const auto parts = hostAndPortOf(address);
+    boost::system::error_code wrong;
+    const auto ip = parts ? asio::ip::make_address(parts->host, wrong) : asio::ip::address();
+    if (!parts || wrong)
+      return Failure{address + ": expected ADDRESS:PORT, with an IP address, or unix:PATH"};
+    host = parts->host;
+    endpoint = asio::ip::tcp::endpoint(ip, parts->port);
+  }
+  boost::system::error_code error;
+  auto& acceptor = _library->acceptor;
+  acceptor.open(endpoint.protocol(), error);
+  if (!error) acceptor.set_option(asio::socket_base::reuse_address(true), error);
+  if (!error) acceptor.bind(endpoint, error);
+  if (!error) acceptor.listen(asio::socket_base::max_listen_connections, error);
+  if (error) return Failure{address + ": " + error.message()};
+  _library->accept();
+  if (!_library->path.empty()) return address;
+  const auto bound = acceptor.local_endpoint();
+  sockaddr_storage storage{};
+  std::memcpy(&storage, bound.data(), std::min<std::size_t>(bound.size(), sizeof storage));
+  const std::uint16_t port =
+      ntohs(storage.ss_family == AF_INET6 ? reinterpret_cast<const sockaddr_in6*>(&storage)->sin6_port
+                                          : reinterpret_cast<const sockaddr_in*>(&storage)->sin_port);
+  return (host.find(':') == std::string::npos ? host : "[" + host + "]") + ":" + std::to_string(port);
+}
+
+void HTTPServer::stop(std::function<void()> done) {
+  boost::asio::post(_library->context, [library = _library.get(), done = std::move(done)]() mutable {
+    library->stopped = std::move(done);
+    library->stopNow();
+  });
+}
+
+void HTTPServer::run() {
+  const auto work = boost::asio::make_work_guard(_library->context);
+  _library->context.run();
+}
+
+void HTTPServer::end() {
+  _library->context.stop();
+}
+
+std::size_t HTTPServer::connections() const {
+  return _library->count;
+}
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,105 @@
+// SPDX-License-Identifier: Apache-2.0
+// Sets libnats up and waits for its callbacks at the end.
+#include "gateway/nats_connection.h"
+
+#include <nats/nats.h>
+
+#include <chrono>
+
+#include "platform/log.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+// A server that does not answer pings is left for another one.
+constexpr std::int64_t kPingMilliseconds = 2'000;
+constexpr int kMostPingsOut = 2;
+constexpr std::int64_t kReconnectMilliseconds = 250;
+constexpr std::int64_t kConnectMilliseconds = 2'000;
+constexpr std::int64_t kWriteMilliseconds = 5'000;
+// A connection that is lost keeps nothing: what was not answered is published again.
+constexpr int kReconnectBytes = 64 << 10;
+constexpr std::chrono::seconds kLongestClose{5};
+
+struct FreeOptions {
+  void operator()(natsOptions* options) const { natsOptions_Destroy(options); }
+};
+using OwnedOptions = std::unique_ptr<natsOptions, FreeOptions>;
+
+natsStatus applyOptions(natsOptions* made, const StreamOptions& given) {
+  std::vector<const char*> servers;
+  for (const std::string& server : given.servers) servers.push_back(server.c_str());
+  natsStatus status = natsOptions_SetServers(made, servers.data(), static_cast<int>(servers.size()));
+  const auto then = [&status](natsStatus next) {
+    if (status == NATS_OK) status = next;
+  };
+  then(natsOptions_SetName(made, "veltra-gateway"));
+  then(natsOptions_SetMaxReconnect(made, -1));
+  then(natsOptions_SetReconnectWait(made, kReconnectMilliseconds));
+  then(natsOptions_SetReconnectBufSize(made, kReconnectBytes));
+  then(natsOptions_SetTimeout(made, kConnectMilliseconds));
+  then(natsOptions_SetWriteDeadline(made, kWriteMilliseconds));
+  then(natsOptions_SetPingInterval(made, kPingMilliseconds));
+  then(natsOptions_SetMaxPingsOut(made, kMostPingsOut));
+  if (!given.credentials.empty())
+    then(natsOptions_SetUserCredentialsFromFiles(made, given.credentials.c_str(), nullptr));
+  if (!given.ca.empty()) then(natsOptions_LoadCATrustedCertificates(made, given.ca.c_str()));
+  return status;
+}
+
+}  // namespace
+
+struct NATSCallbacks {
+  static void connected(natsConnection*, void* closure) {
+    const auto* self = static_cast<NATSConnection*>(closure);
+    logInfo("stream: connected");
+    if (self->_reconnected) self->_reconnected();
+  }
+  static void disconnected(natsConnection*, void*) { logWarning("stream: disconnected"); }
+  static void closed(natsConnection*, void* closure) {
+    static_cast<NATSConnection*>(closure)->_closed.set_value();
+  }
+  // Without it the library writes to standard error.
+  static void failed(natsConnection*, natsSubscription*, natsStatus status, void*) {
+    logDebug("stream: %s", natsStatus_GetText(status));
+  }
+};
+
+Result<std::unique_ptr<NATSConnection>, std::string> NATSConnection::open(const StreamOptions& options,
+                                                                          std::function<void()> reconnected) {
+  std::unique_ptr<NATSConnection> self(new NATSConnection);
+  self->_reconnected = std::move(reconnected);
+  natsOptions* made = nullptr;
+  natsStatus status = natsOptions_Create(&made);
+  const OwnedOptions owned(made);
+  if (status == NATS_OK) status = applyOptions(made, options);
+  if (status == NATS_OK) status = natsOptions_SetReconnectedCB(made, &NATSCallbacks::connected, self.get());
+  if (status == NATS_OK) status = natsOptions_SetDisconnectedCB(made, &NATSCallbacks::disconnected, nullptr);
+  if (status == NATS_OK) status = natsOptions_SetClosedCB(made, &NATSCallbacks::closed, self.get());
+  if (status == NATS_OK) status = natsOptions_SetErrorHandler(made, &NATSCallbacks::failed, nullptr);
+  if (status == NATS_OK)
+    status = natsOptions_SetRetryOnFailedConnect(made, true, &NATSCallbacks::connected, self.get());
+  if (status == NATS_OK) {
+    status = natsConnection_Connect(&self->_connection, made);
+    if (status == NATS_NOT_YET_CONNECTED) status = NATS_OK;
+  }
+  if (status == NATS_OK) status = natsConnection_JetStream(&self->_jetStream, self->_connection, nullptr);
+  if (status != NATS_OK)
+    return Failure{std::string("the stream's servers cannot be used: ") + natsStatus_GetText(status)};
+  return self;
+}
+
+NATSConnection::~NATSConnection() {
+  jsCtx_Destroy(_jetStream);
+  if (!_connection) return;
+  natsConnection_Close(_connection);
+  _closed.get_future().wait_for(kLongestClose);
+  natsConnection_Destroy(_connection);
+}
+
+bool NATSConnection::connected() const {
+  return natsConnection_Status(_connection) == NATS_CONN_STATUS_CONNECTED;
+}
+
+}  // namespace veltrad::gateway

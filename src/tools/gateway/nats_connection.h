@@ -1,0 +1,56 @@
+// SPDX-License-Identifier: Apache-2.0
+// The connection to the stream's servers, which libnats makes and keeps.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <future>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "base/result.h"
+
+struct __natsConnection;
+struct __jsCtx;
+
+namespace veltrad::gateway {
+
+struct StreamOptions {
+  // "nats://HOST:PORT"
+  std::vector<std::string> servers{"nats://127.0.0.1:4222"};
+  std::string name = "VELTRA";
+  // What stands before each subject, with a dot at its end.
+  std::string prefix = "veltra.";
+  int copies = 3;
+  // What the stream may hold; beyond it the stream takes nothing. 0: no bound.
+  std::int64_t mostBytes = 0;
+  // Files with a user's credentials, and with the certificates that the servers' are signed by; empty: none.
+  std::string credentials;
+  std::string ca;
+};
+
+// Closes the connection when it is destroyed. Any thread.
+class NATSConnection {
+ public:
+  // Does not wait for a server to be there. `reconnected` is called on a thread of the library.
+  static Result<std::unique_ptr<NATSConnection>, std::string> open(const StreamOptions& options,
+                                                                   std::function<void()> reconnected);
+  ~NATSConnection();
+
+  bool connected() const;
+  __natsConnection* get() const { return _connection; }
+  __jsCtx* jetStream() const { return _jetStream; }
+
+ private:
+  friend struct NATSCallbacks;
+  NATSConnection() = default;
+
+  __natsConnection* _connection = nullptr;
+  __jsCtx* _jetStream = nullptr;
+  std::function<void()> _reconnected;
+  // No callback follows.
+  std::promise<void> _closed;
+};
+
+}  // namespace veltrad::gateway

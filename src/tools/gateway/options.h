@@ -1,0 +1,58 @@
+// SPDX-License-Identifier: Apache-2.0
+// The command line of veltra-gateway.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "tools/command_line.h"
+
+namespace veltrad::gateway {
+
+struct StreamArguments {
+  std::vector<std::string> servers{"nats://127.0.0.1:4222"};
+  std::string name = "VELTRA";
+  std::string prefix = "veltra.";
+  std::string credentials;
+  std::string ca;
+};
+
+struct ServeArguments {
+  std::string listen = "127.0.0.1:8080";
+  std::string admin = "127.0.0.1:8081";
+  // Empty: no datagrams are taken.
+  std::string dashboard;
+  int copies = 3;
+  std::int64_t streamBytes = 0;
+  double hold = 15;
+  std::size_t holdBytes = 256u << 20;
+  std::size_t holdMessages = 16'384;
+  std::size_t connections = 16'000;
+  int shed = 429;
+};
+
+struct DrainArguments {
+  std::string admin = "127.0.0.1:8082";
+  // As libpq takes it; empty: from the environment.
+  std::string database;
+  std::string files = "files";
+  int batch = 1'000;
+  double purgeAfter = 150;
+  double postDays = 8;
+  double keepDays = 0;
+};
+
+struct Arguments {
+  StreamArguments stream;
+  ServeArguments serve;
+  DrainArguments drain;
+  bool drains = false;
+};
+
+void describe(CLI::App& app, Arguments& given);
+
+// For the reference pages.
+tools::CommandLine commandLine();
+
+}  // namespace veltrad::gateway

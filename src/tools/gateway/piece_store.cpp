@@ -1,0 +1,140 @@
+// SPDX-License-Identifier: Apache-2.0
+// Writes pieces at their places.
+#include "gateway/piece_store.h"
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <charconv>
+#include <chrono>
+#include <cstring>
+#include <filesystem>
+#include <optional>
+
+#include "base/file_descriptor.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::uint64_t kMostBody = std::uint64_t{1} << 40;
+constexpr std::uint64_t kMostInMemory = 512u << 20;
+constexpr std::chrono::hours kForgottenAfter{24};
+
+struct PiecePlace {
+  std::string token;
+  std::uint64_t offset = 0;
+};
+
+// A token is a file's name, so nothing but hexadecimal digits is taken.
+std::optional<PiecePlace> placeIn(std::string_view text) {
+  const std::size_t blank = text.find(' ');
+  PiecePlace place{std::string(text.substr(0, blank)), 0};
+  if (blank == std::string_view::npos || place.token.empty() || place.token.size() > 64 ||
+      place.token.find_first_not_of("0123456789abcdef") != std::string::npos)
+    return std::nullopt;
+  const auto read = std::from_chars(text.data() + blank + 1, text.data() + text.size(), place.offset);
+  if (read.ec != std::errc() || read.ptr != text.data() + text.size() || place.offset > kMostBody)
+    return std::nullopt;
+  return place;
+}
+
+Failure<StoreError> failureOfFile(const std::string& path) {
+  return passingFailure(path + ": " + std::strerror(errno));
+}
+
+}  // namespace
+
+Result<Done, StoreError> PieceStore::open() {
+  std::error_code error;
+  const fs::path below = fs::path(_folder) / "incoming";
+  fs::create_directories(below, error);
+  if (error) return passingFailure(below.string() + ": " + error.message());
+  for (const auto& entry : fs::directory_iterator(below, error)) {
+    const auto changed = entry.last_write_time(error);
+    if (!error && changed < fs::file_time_type::clock::now() - kForgottenAfter)
+      fs::remove(entry.path(), error);
+  }
+  return Done();
+}
+
+Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_view bytes) {
+  const auto where = placeIn(place);
+  if (!where) return dataFailure(fmt::format("a piece without a place: \"{}\"", place));
+  const std::string path = incoming(where->token);
+  const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0640));
+  if (!file.isOpen()) return failureOfFile(path);
+  _unsynced.insert(path);
+  std::uint64_t at = where->offset;
+  while (!bytes.empty()) {
+    const ssize_t count = ::pwrite(file.get(), bytes.data(), bytes.size(), static_cast<off_t>(at));
+    if (count < 0 && errno != EINTR) return failureOfFile(path);
+    if (count < 0) continue;
+    at += static_cast<std::uint64_t>(count);
+    bytes.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return Done();
+}
+
+Result<std::string, StoreError> PieceStore::wholeOf(std::string_view place, std::string_view last) {
+  if (place.empty()) return std::string(last);
+  const auto where = placeIn(place);
+  if (!where || where->offset > kMostInMemory)
+    return dataFailure(fmt::format("a body without a place: \"{}\"", place));
+  const std::string path = incoming(where->token);
+  const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+  if (!file.isOpen()) return failureOfFile(path);
+  std::string body(where->offset, '\0');
+  for (std::size_t at = 0; at < body.size();) {
+    const ssize_t count = ::pread(file.get(), &body[at], body.size() - at, static_cast<off_t>(at));
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return failureOfFile(path);
+    if (count == 0) return dataFailure(path + ": pieces are missing");
+    at += static_cast<std::size_t>(count);
+  }
+  return body.append(last);
+}
+
+Result<std::string, StoreError> PieceStore::keep(std::string_view place, std::string_view last,
+                                                 const std::string& day, const std::string& name) {
+  const std::string kept = day + "/" + name;
+  const std::string path = _folder + "/" + kept;
+  std::error_code error;
+  fs::create_directories(_folder + "/" + day, error);
+  if (error) return passingFailure(path + ": " + error.message());
+  // A batch that is repeated finds the file that it has made.
+  if (fs::exists(path, error)) return kept;
+  const std::string whole = place.empty() ? name + " 0" : std::string(place);
+  const auto where = placeIn(whole);
+  if (!where) return dataFailure(fmt::format("a file without a place: \"{}\"", whole));
+  if (!place.empty() && !fs::exists(incoming(where->token), error))
+    return dataFailure(path + ": its pieces are missing");
+  if (auto written = write(whole, last); !written) return Failure{written.error()};
+  const std::string from = incoming(where->token);
+  const FileDescriptor file(::open(from.c_str(), O_WRONLY | O_CLOEXEC));
+  if (::fsync(file.get()) != 0 || ::rename(from.c_str(), path.c_str()) != 0) return failureOfFile(from);
+  _unsynced.erase(from);
+  _unsynced.insert(_folder + "/" + day);
+  return kept;
+}
+
+Result<Done, StoreError> PieceStore::sync() {
+  for (const std::string& path : _unsynced) {
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+    if (!file.isOpen() && errno == ENOENT) continue;
+    if (!file.isOpen() || ::fsync(file.get()) != 0) return failureOfFile(path);
+  }
+  _unsynced.clear();
+  return Done();
+}
+
+void PieceStore::forget(std::string_view place) {
+  if (const auto where = placeIn(place)) ::unlink(incoming(where->token).c_str());
+}
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,44 @@
+// SPDX-License-Identifier: Apache-2.0
+// A body that is kept whole while it is received, unpacked and within bounds.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "gateway/door.h"
+#include "support/gunzip.h"
+
+namespace veltrad::gateway {
+
+class ReceivedBody {
+ public:
+  // `most`: of the body as it comes and unpacked, in bytes.
+  ReceivedBody(const DoorServices& services, bool packed, std::uint64_t most);
+  ~ReceivedBody();
+
+  // The next bytes; an answer refuses them.
+  std::optional<Answer> add(std::string_view bytes);
+  // After the last byte: a gzip stream that is cut short is refused.
+  std::optional<Answer> end();
+  const std::string& text() const { return _text; }
+  // Leaves it empty.
+  std::string take() { return std::move(_text); }
+
+ private:
+  Answer refusedGzip(support::Gunzip::State state);
+  bool grow(std::size_t bytes);
+
+  const DoorServices& _services;
+  const std::uint64_t _most;
+  std::optional<support::Gunzip> _gunzip;
+  std::string _text;
+  std::uint64_t _received = 0;
+  // Of the budget.
+  std::uint64_t _charged = 0;
+};
+
+// The status and reason of a gzip stream that is not as it should be.
+Refusal refusalOf(support::Gunzip::State state, std::uint64_t most);
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,60 @@
+// SPDX-License-Identifier: Apache-2.0
+// Makes answers without a body, because a daemon may take any body for a receipt.
+#include "gateway/refusals.h"
+
+#include "base/text.h"
+#include "platform/uuid.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+constexpr const char* kRefusedHeader = "X-VLT-Refused";
+constexpr std::size_t kMostDetailBytes = 512;
+// Seconds; the random part spreads those who come back.
+constexpr unsigned kRetryAfter = 5;
+constexpr unsigned kRetrySpread = 10;
+
+// A header takes no control characters, and few servers take others than ASCII.
+std::string asHeader(const std::string& text) {
+  std::string out;
+  for (const char c : escapedForLog(text).substr(0, kMostDetailBytes)) out += c >= ' ' && c <= '~' ? c : '?';
+  return out;
+}
+
+}  // namespace
+
+bool KeepingRate::allows(Time now) {
+  if (!_second || now >= *_second + std::chrono::seconds(1)) {
+    _second = now;
+    _kept = 0;
+  }
+  return _kept++ < kMostASecond;
+}
+
+Answer Refusals::answer(const Refusal& refusal) {
+  _metrics.refused.add(refusal.reason);
+  Answer answer{refusal.status, "", "", {{kRefusedHeader, asHeader(refusal.detail)}}};
+  if (refusal.status == 405) answer.headers.emplace_back("Allow", "POST");
+  return answer;
+}
+
+Answer Refusals::malformed(const char* reason, const std::string& detail, std::string_view body) {
+  if (_rate.allows(std::chrono::steady_clock::now())) {
+    Message message{
+        subject::kRefused,
+        "refused " + platform::randomUUIDText(),
+        {{header::kReason, escapedForLog(std::string(reason) + ": " + detail).substr(0, kMostDetailBytes)}},
+        std::string(body.substr(0, kMostKeptBytes))};
+    _publisher.publish(std::move(message), [](Outcome) {});
+  }
+  return answer({400, reason, std::string(reason) + ": " + detail});
+}
+
+Answer Refusals::busy(const char* reason) {
+  _metrics.refused.add(reason);
+  const unsigned spread = platform::randomUUID()[0] % kRetrySpread;
+  return {_shed, "", "", {{kRefusedHeader, reason}, {"Retry-After", std::to_string(kRetryAfter + spread)}}};
+}
+
+}  // namespace veltrad::gateway

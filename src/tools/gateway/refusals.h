@@ -1,0 +1,57 @@
+// SPDX-License-Identifier: Apache-2.0
+// Answers that refuse: counts them, and keeps apart what was malformed.
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "gateway/http_server.h"
+#include "gateway/publisher.h"
+
+namespace veltrad::gateway {
+
+// Why a request was refused: the name under which it is counted, and a line for people.
+struct Refusal {
+  int status;
+  const char* reason;
+  std::string detail;
+};
+
+// Limits what is kept: at most ten in a second.
+class KeepingRate {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+  static constexpr int kMostASecond = 10;
+
+  bool allows(Time now);
+
+ private:
+  std::optional<Time> _second;
+  int _kept = 0;
+};
+
+// Used on the server's thread. The publisher and the metrics must outlive it.
+class Refusals {
+ public:
+  static constexpr std::size_t kMostKeptBytes = 64u << 10;
+
+  // `shed`: the status in place of 429.
+  Refusals(Publisher& publisher, Metrics& metrics, int shed)
+      : _publisher(publisher), _metrics(metrics), _shed(shed) {}
+
+  Answer answer(const Refusal& refusal);
+  // The same for a body that is malformed, which is kept apart.
+  Answer malformed(const char* reason, const std::string& detail, std::string_view body);
+  // For what the stream has not taken, or that there is no room for. Any thread.
+  Answer busy(const char* reason);
+
+ private:
+  Publisher& _publisher;
+  Metrics& _metrics;
+  const int _shed;
+  KeepingRate _rate;
+};
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,144 @@
+// SPDX-License-Identifier: Apache-2.0
+// Puts the gateway's parts together and takes them apart in order.
+#include "gateway/serve.h"
+
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdio>
+#include <future>
+
+#include "formats/json.h"
+#include "gateway/admin.h"
+#include "gateway/datagram_door.h"
+#include "gateway/door.h"
+#include "platform/service_manager.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+// What has begun is answered until then; the process ends soon after.
+constexpr std::chrono::seconds kLongestStop{13};
+constexpr std::size_t kServingStackBytes = 1u << 20;
+
+sigset_t stopSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGTERM);
+  sigaddset(&signals, SIGINT);
+  return signals;
+}
+
+int failed(const std::string& why) {
+  std::fprintf(stderr, "veltra-gateway: %s\n", why.c_str());
+  return 1;
+}
+
+// A connection takes a descriptor.
+void raiseDescriptorLimit() {
+  rlimit limit{};
+  if (::getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  ::setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+HeldMessages::Bounds heldBounds(const ServeArguments& given) {
+  HeldMessages::Bounds bounds;
+  bounds.bytes = given.holdBytes;
+  bounds.messages = given.holdMessages;
+  bounds.hold = std::chrono::duration_cast<HeldMessages::Duration>(std::chrono::duration<double>(given.hold));
+  return bounds;
+}
+
+BodyBounds bodyBounds(const ServeArguments& given) {
+  BodyBounds bounds;
+  bounds.together = given.holdBytes;
+  return bounds;
+}
+
+std::string asURL(const std::string& address) {
+  return address.starts_with("unix:") ? address : "http://" + address;
+}
+
+}  // namespace
+
+void blockStopSignals() {
+  const sigset_t signals = stopSignals();
+  pthread_sigmask(SIG_BLOCK, &signals, nullptr);
+  std::signal(SIGPIPE, SIG_IGN);
+}
+
+void awaitStop() {
+  const sigset_t signals = stopSignals();
+  int signal = 0;
+  sigwait(&signals, &signal);
+}
+
+void sayReady(const Dictionary& line) {
+  std::printf("%s\n", formats::writeJSON(line).c_str());
+  std::fflush(stdout);
+  platform::ServiceManager().ready();
+}
+
+StreamOptions streamOptions(const StreamArguments& given) {
+  StreamOptions options;
+  options.servers = given.servers;
+  options.name = given.name;
+  options.prefix = given.prefix;
+  options.credentials = given.credentials;
+  options.ca = given.ca;
+  return options;
+}
+
+int serve(const Arguments& given) {
+  blockStopSignals();
+  raiseDescriptorLimit();
+  Metrics metrics;
+  StreamOptions stream = streamOptions(given.stream);
+  stream.copies = given.serve.copies;
+  stream.mostBytes = given.serve.streamBytes;
+  auto opened = Publisher::open(stream, heldBounds(given.serve), metrics);
+  if (!opened) return failed(opened.error());
+  // Destroyed first, so that no completion comes after what it uses.
+  std::unique_ptr<Publisher> publisher = std::move(opened).value();
+  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed);
+  HTTPServer server([&door](const RequestHead& head) { return door.request(head); },
+                    {.connections = given.serve.connections});
+  const auto listen = server.listen(given.serve.listen);
+  if (!listen) return failed("--listen " + listen.error());
+  DatagramDoor datagrams(*publisher, metrics);
+  Dictionary line{{"listen", asURL(listen.value())}, {"pid", static_cast<long>(::getpid())}};
+  if (!given.serve.dashboard.empty()) {
+    const auto bound = datagrams.start(given.serve.dashboard);
+    if (!bound) return failed("--dashboard " + bound.error());
+    line.set("dashboard", bound.value());
+  }
+  Admin admin({[&publisher] { return publisher->ready() ? "" : "the stream is not there"; },
+               [&publisher, &metrics, &server] {
+                 metrics.connections = static_cast<std::int64_t>(server.connections());
+                 return metrics.text(publisher->held());
+               }});
+  const auto looked = admin.start(given.serve.admin);
+  if (!looked) return failed("--admin " + looked.error());
+  line.set("admin", asURL(looked.value()));
+  Thread serving;
+  if (!serving.start("http", kServingStackBytes, [&server] { server.run(); }))
+    return failed("a thread cannot be started");
+  sayReady(line);
+  awaitStop();
+  platform::ServiceManager().stopping();
+  const auto end = std::chrono::steady_clock::now() + kLongestStop;
+  datagrams.stop();
+  publisher->endBy(end);
+  std::promise<void> idle;
+  server.stop([&idle] { idle.set_value(); });
+  idle.get_future().wait_until(end + std::chrono::seconds(1));
+  server.end();
+  serving.join();
+  publisher.reset();
+  return 0;
+}
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,26 @@
+// SPDX-License-Identifier: Apache-2.0
+// The gateway as a process: from its start to SIGTERM.
+#pragma once
+
+#include <string>
+
+#include "base/value.h"
+#include "gateway/nats_connection.h"
+#include "tools/gateway/options.h"
+
+namespace veltrad::gateway {
+
+// Blocks SIGTERM and SIGINT, so that only awaitStop() gets them. Before any thread is started.
+void blockStopSignals();
+// Returns when one of them has come.
+void awaitStop();
+// One JSON line on standard output, and the word to the service manager.
+void sayReady(const Dictionary& line);
+
+StreamOptions streamOptions(const StreamArguments& given);
+
+// Both return the exit status, and have said on standard error why it is not 0.
+int serve(const Arguments& given);
+int drain(const Arguments& given);
+
+}  // namespace veltrad::gateway

@@ -1,0 +1,162 @@
+// SPDX-License-Identifier: Apache-2.0
+// Publishes with a reply subject for each message, and reads the answers.
+#include "gateway/stream.h"
+
+#include <nats/nats.h>
+
+#include <charconv>
+#include <chrono>
+#include <string_view>
+
+#include "formats/json.h"
+#include "platform/log.h"
+
+namespace veltrad::gateway {
+
+namespace {
+
+constexpr std::size_t kWatchStackBytes = 256u << 10;
+constexpr std::int64_t kAnswerMilliseconds = 1'500;
+constexpr std::int64_t kDuplicatesNanoseconds = 120'000'000'000;
+constexpr int kMostAnswersWaiting = 1 << 20;
+constexpr std::chrono::seconds kLongestUnsubscribe{5};
+constexpr const char* kStatusHeader = "Status";
+
+// The answer of a stream: {"stream": …, "seq": …} or {"error": {"description": …}}. Empty if it has taken the
+// message.
+std::string refusalIn(natsMsg* answer) {
+  const char* status = nullptr;
+  if (natsMsg_GetDataLength(answer) == 0)
+    return natsMsgHeader_Get(answer, kStatusHeader, &status) == NATS_OK
+               ? std::string("nobody listens, status ") + status
+               : "an empty answer";
+  const std::string_view text(natsMsg_GetData(answer),
+                              static_cast<std::size_t>(natsMsg_GetDataLength(answer)));
+  const auto parsed = formats::parseJSON(text);
+  const Dictionary* fields = parsed ? parsed.value().asDictionary() : nullptr;
+  if (!fields) return "an answer that is no object";
+  if (const Dictionary* error = fields->dictionary("error")) {
+    const std::string* description = error->string("description");
+    return description && !description->empty() ? *description : "an error without a description";
+  }
+  return fields->contains("seq") ? "" : "an answer without a place in the stream";
+}
+
+}  // namespace
+
+struct StreamCallbacks {
+  static void answered(natsConnection*, natsSubscription*, natsMsg* answer, void* closure) {
+    const auto* self = static_cast<Stream*>(closure);
+    const std::string_view subject = natsMsg_GetSubject(answer);
+    std::uint64_t token = 0;
+    if (subject.size() > self->_inbox.size())
+      std::from_chars(subject.data() + self->_inbox.size(), subject.data() + subject.size(), token);
+    self->_listener.answered(token, refusalIn(answer));
+    natsMsg_Destroy(answer);
+  }
+  static void unsubscribed(void* closure) { static_cast<Stream*>(closure)->_unsubscribed.set_value(); }
+};
+
+Stream::Stream(StreamOptions options, Listener listener)
+    : _options(std::move(options)), _listener(std::move(listener)) {}
+
+Result<std::unique_ptr<Stream>, std::string> Stream::open(StreamOptions options, Listener listener) {
+  std::unique_ptr<Stream> self(new Stream(std::move(options), std::move(listener)));
+  auto connection = NATSConnection::open(self->_options, self->_listener.back);
+  if (!connection) return Failure{std::move(connection.error())};
+  self->_connection = std::move(connection).value();
+  natsInbox* inbox = nullptr;
+  natsStatus status = natsInbox_Create(&inbox);
+  if (status == NATS_OK) {
+    self->_inbox = std::string(inbox) + ".";
+    natsInbox_Destroy(inbox);
+    status = natsConnection_Subscribe(&self->_answers, self->_connection->get(), (self->_inbox + "*").c_str(),
+                                      &StreamCallbacks::answered, self.get());
+  }
+  if (status == NATS_OK)
+    status = natsSubscription_SetOnCompleteCB(self->_answers, &StreamCallbacks::unsubscribed, self.get());
+  if (status == NATS_OK) status = natsSubscription_SetPendingLimits(self->_answers, kMostAnswersWaiting, -1);
+  if (status != NATS_OK) return Failure{std::string("no answers can be read: ") + natsStatus_GetText(status)};
+  Stream* raw = self.get();
+  if (!self->_watch.start("stream watch", kWatchStackBytes, [raw] { raw->watch(); }))
+    return Failure{std::string("a thread cannot be started")};
+  return self;
+}
+
+Stream::~Stream() {
+  {
+    const Lock hold(_mutex);
+    _stopping = true;
+  }
+  _changed.notifyAll();
+  _watch.join();
+  if (_answers) {
+    natsSubscription_Unsubscribe(_answers);
+    _unsubscribed.get_future().wait_for(kLongestUnsubscribe);
+    natsSubscription_Destroy(_answers);
+  }
+}
+
+void Stream::publish(std::uint64_t token, const Message& message) {
+  if (!_connection->connected()) return;
+  natsMsg* made = nullptr;
+  const std::string to = _options.prefix + message.subject;
+  const std::string answerTo = _inbox + std::to_string(token);
+  natsStatus status = natsMsg_Create(&made, to.c_str(), answerTo.c_str(), message.body.data(),
+                                     static_cast<int>(message.body.size()));
+  if (status == NATS_OK) status = natsMsgHeader_Set(made, header::kMessageID, message.id.c_str());
+  for (const auto& [name, text] : message.headers) {
+    if (status == NATS_OK) status = natsMsgHeader_Set(made, name.c_str(), text.c_str());
+  }
+  if (status == NATS_OK) status = natsConnection_PublishMsg(_connection->get(), made);
+  natsMsg_Destroy(made);
+  // It is published again when no answer comes.
+  if (status != NATS_OK) logDebug("stream: a message was not published: %s", natsStatus_GetText(status));
+}
+
+bool Stream::isThere() {
+  if (!_connection->connected()) return false;
+  jsOptions options;
+  jsOptions_Init(&options);
+  options.Wait = kAnswerMilliseconds;
+  jsStreamInfo* info = nullptr;
+  jsErrCode error = static_cast<jsErrCode>(0);
+  natsStatus status =
+      js_GetStreamInfo(&info, _connection->jetStream(), _options.name.c_str(), &options, &error);
+  if (status == NATS_NOT_FOUND && error == JSStreamNotFoundErr) {
+    const std::string all = _options.prefix + ">";
+    const char* subjects[] = {all.c_str()};
+    jsStreamConfig wanted;
+    jsStreamConfig_Init(&wanted);
+    wanted.Name = _options.name.c_str();
+    wanted.Subjects = subjects;
+    wanted.SubjectsLen = 1;
+    wanted.Discard = js_DiscardNew;
+    wanted.Storage = js_FileStorage;
+    wanted.Replicas = _options.copies;
+    wanted.Duplicates = kDuplicatesNanoseconds;
+    if (_options.mostBytes > 0) wanted.MaxBytes = _options.mostBytes;
+    status = js_AddStream(&info, _connection->jetStream(), &wanted, &options, &error);
+    if (status == NATS_OK)
+      logInfo("stream: %s is made, with %d copies", _options.name.c_str(), _options.copies);
+  }
+  jsStreamInfo_Destroy(info);
+  if (status != NATS_OK)
+    logDebug("stream: %s is not there: %s, error %d", _options.name.c_str(), natsStatus_GetText(status),
+             static_cast<int>(error));
+  return status == NATS_OK;
+}
+
+void Stream::watch() {
+  for (;;) {
+    const bool there = isThere();
+    const bool was = _ready.exchange(there);
+    if (there != was) logInfo("stream: %s is %s", _options.name.c_str(), there ? "ready" : "not ready");
+    if (there && !was) _listener.back();
+    const Lock hold(_mutex);
+    if (!_stopping) _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + std::chrono::seconds(1));
+    if (_stopping) return;
+  }
+}
+
+}  // namespace veltrad::gateway

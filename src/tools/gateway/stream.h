@@ -1,0 +1,63 @@
+// SPDX-License-Identifier: Apache-2.0
+// The stream, as those use it who put messages into it.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <functional>
+#include <future>
+#include <memory>
+#include <string>
+
+#include "base/mutex.h"
+#include "base/result.h"
+#include "base/thread.h"
+#include "gateway/message.h"
+#include "gateway/nats_connection.h"
+
+struct __natsSubscription;
+
+namespace veltrad::gateway {
+
+// Publishes without waiting for answers. A thread of its own makes the stream where it is missing and asks
+// every second whether it is there.
+class Stream {
+ public:
+  struct Listener {
+    // The stream has answered. `why` is empty if it has taken the message.
+    std::function<void(std::uint64_t token, const std::string& why)> answered;
+    // The servers can be reached again, or the stream is there again.
+    std::function<void()> back;
+  };
+
+  // The listener is called on threads of the library, until the destructor has returned.
+  static Result<std::unique_ptr<Stream>, std::string> open(StreamOptions options, Listener listener);
+  ~Stream();
+
+  // The answer brings the token. Nothing happens while no server can be reached.
+  void publish(std::uint64_t token, const Message& message);
+  // Whether the stream was there when it was asked last.
+  bool ready() const { return _ready.load(std::memory_order_relaxed); }
+
+ private:
+  friend struct StreamCallbacks;
+  Stream(StreamOptions options, Listener listener);
+  void watch();
+  bool isThere();
+
+  const StreamOptions _options;
+  const Listener _listener;
+  std::unique_ptr<NATSConnection> _connection;
+  __natsSubscription* _answers = nullptr;
+  // Answers to a message come to this and its token.
+  std::string _inbox;
+  std::atomic<bool> _ready{false};
+  // No answer follows.
+  std::promise<void> _unsubscribed;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  Condition _changed;
+  bool _stopping GUARDED_BY(_mutex) = false;
+  Thread _watch;
+};
+
+}  // namespace veltrad::gateway

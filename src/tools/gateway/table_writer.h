@@ -1,0 +1,71 @@
+// SPDX-License-Identifier: Apache-2.0
+// Writes batches of messages to the tables, each batch with the place in the stream in one transaction.
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "base/result.h"
+#include "gateway/database.h"
+#include "gateway/piece_store.h"
+#include "gateway/table_rows.h"
+
+namespace veltrad::gateway {
+
+// A batch in the making: its rows, and what is to be done after its commit.
+struct Batch {
+  TableRows rows;
+  // The pieces that are not needed any more.
+  std::vector<std::string> places;
+  std::uint64_t skipped = 0;
+};
+
+// Used by one thread. The folder must outlive it.
+class TableWriter {
+ public:
+  struct Written {
+    std::uint64_t events = 0;
+    // Posts that the tables had already.
+    std::uint64_t skipped = 0;
+    // Messages that no table can take, which are in "refused" now.
+    std::uint64_t refused = 0;
+  };
+
+  // Takes the place of the one drain that is active: false if another has it.
+  static Result<bool, StoreError> becomeActive(Database& database);
+  // Makes the tables that are missing.
+  static Result<Done, StoreError> prepare(Database& database);
+
+  TableWriter(std::unique_ptr<Database> database, PieceStore& files, std::string stream)
+      : _database(std::move(database)), _files(files), _stream(std::move(stream)) {}
+
+  // Everything up to this place of the stream is in the tables. A stream that was made at another time begins
+  // at 0.
+  Result<std::uint64_t, StoreError> position(std::int64_t created);
+  // After an error nothing is written, unless the error came with the commit: ask for the position then.
+  Result<Written, StoreError> write(const std::vector<Taken>& messages);
+  // Forgets what is older: IDs of posts, and everything else unless `keepDays` is 0.
+  Result<Done, StoreError> forget(double postDays, double keepDays);
+
+ private:
+  // With a refusal the messages go to "refused" for this reason.
+  Result<Written, StoreError> writeTogether(const Taken* begin, const Taken* end, const std::string& refusal);
+  Result<Batch, StoreError> batchOf(const Taken* begin, const Taken* end, std::set<std::string> seen,
+                                    const std::string& refusal);
+  Result<Done, StoreError> add(const Taken& message, TableRows& rows);
+  Result<std::set<std::string>, StoreError> knownPosts(const Taken* begin, const Taken* end);
+  Result<Done, StoreError> copyRows(const TableRows& rows);
+  Result<Done, StoreError> advance(std::uint64_t seq);
+
+  const std::unique_ptr<Database> _database;
+  PieceStore& _files;
+  const std::string _stream;
+  std::int64_t _created = 0;
+  std::uint64_t _position = 0;
+  std::set<std::string> _days;
+};
+
+}  // namespace veltrad::gateway

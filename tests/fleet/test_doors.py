@@ -1,0 +1,189 @@
+# SPDX-License-Identifier: Apache-2.0
+"""What gateways take and refuse, and that it is in the tables as it came."""
+import gzip
+import hashlib
+import json
+import os
+import pathlib
+import plistlib
+import socket
+import subprocess
+import time
+import unittest
+import urllib.request
+
+import side
+from devices import GZIP, JSON, Dashboard, Door, FleetTest, datagram, envelope, packed, post_id
+
+
+class Doors(FleetTest):
+    def test_refusals_have_a_status_and_no_body(self):
+        good, upload = envelope({"a": 1}), "/upload?uuid=u&sequence=1&filename=f.gz&raw=true"
+        whole = packed(good)
+        zipped = {**JSON, "Content-Encoding": "gzip"}
+        rows = [  # method, path, body, headers, status
+            ("POST", "/events", b"{", JSON, 400),
+            ("POST", "/events", b"", JSON, 400),
+            ("POST", "/events", b'{"clientId": 1, "events": []}', JSON, 400),
+            ("POST", "/events", envelope({"a": {"b": 1}}), JSON, 400),
+            ("POST", "/events", good.replace(b'"a"', b'"\xff"'), JSON, 400),
+            ("POST", "/events", whole[:-1], zipped, 400),
+            ("POST", "/events", whole + b"x", zipped, 400),
+            ("POST", "/events", good, zipped, 400),
+            ("POST", "/events", packed(b" " * (16 << 20) + good), zipped, 413),
+            ("POST", "/events", b" " * (16 << 20) + good, JSON, 413),
+            ("POST", "/nothing", good, JSON, 404),
+            ("POST", "/events/A", good, JSON, 404),
+            ("POST", "/live", good, JSON, 404),
+            ("POST", "/events", good, {"Content-Type": "text/plain"}, 415),
+            ("POST", "/events", good, {**JSON, "Content-Encoding": "br"}, 415),
+            ("POST", upload, packed(b"x")[:-4], GZIP, 400),
+            ("POST", upload.replace("=1", "=one"), packed(b"x"), GZIP, 400),
+            ("POST", "/logdata", b"no list", {"Content-Type": "application/octet-stream"}, 400),
+            ("POST", "/logdata", plistlib.dumps({}, fmt=plistlib.FMT_BINARY), {}, 400),
+        ]
+        for where, door in ("direct", self.direct()), ("through nginx", self.through()):
+            for method, path, body, headers, status in rows:
+                with self.subTest(where=where, path=path, body=body[:40], headers=headers):
+                    answer = door.request(method, path, body, headers)
+                    self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
+                    if where == "direct":
+                        self.assertTrue(answer.headers["X-VLT-Refused"])
+            self.assertIn(door.request("GET", "/events").status, (403, 405))
+            door.close()
+            large = door.request("POST", "/events", good, {**JSON, "X-Large": "x" * 65536})
+            self.assertIn(large.status, (400, 431))
+            self.assertEqual(large.body, b"")
+        self.assertIn(self.through().request("GET", "/metrics").status, (403, 404))
+        reasons = {row[0] for row in self.rows("SELECT DISTINCT split_part(reason, ':', 1) FROM veltra.refused", 3)}
+        self.assertLessEqual({"events", "gzip", "log_data"}, reasons)
+        metrics = urllib.request.urlopen(self.line["gateways"][0]["admin"] + "/metrics").read().decode()
+        self.assertIn('veltra_gateway_refused_total{reason="gzip"}', metrics)
+        self.assertTrue(metrics.endswith("# EOF\n"))
+
+    def test_events_stand_in_the_table_as_they_came(self):
+        event = {"_sender": "FU", "_sessionID": "A.B", "_method": 5, "_status": 10, "_eventNumber": 7, "eventTime": 1400000000.25,
+                 "text": "tab\t \\ \"quoted\" \n é 😀", "flag": True, "large": 2**64 - 1, "real": 1.5e300}
+        body = envelope(event, {"eventTime": 1e12, "nul": "\0", "_sessionID": 42}, client="it's")
+        body = body.replace(b'"nul"', b'"half": "\\ud83d", "nul"')
+        answer = self.through().post("/events/call", body)
+        self.assertEqual((answer.status, answer.body), (200, b""))
+        first, second = self.rows("SELECT client_id, sender, session_id, session_path, category, type, event_number, via, index, "
+                                  "extract(epoch FROM happened), fields FROM veltra.events WHERE client_id = 'it''s' ORDER BY index", 2)
+        self.assertEqual(first[:10], ["it's", "FU", "A.B", "{A,B}", "5", "10", "7", "call", "0", "1400000000.250000"])
+        fields = json.loads(first[10])
+        self.assertEqual({**fields, "real": float(fields["real"])}, event)  # the database writes such a number in full
+        self.assertEqual(second[2:10], ["42", "{42}", "", "", "", "call", "1", ""])
+        self.assertEqual(json.loads(second[10]), {"eventTime": 1e12, "nul": "�", "half": "�", "_sessionID": 42})
+
+    def test_the_same_again_is_kept_once(self):
+        identifier, body = post_id(), envelope({"n": 1}, client="again")
+        doors = [self.direct(0), self.direct(1), self.through()]
+        for door in doors * 2:
+            self.assertEqual(door.post("/events", body, X_VLT_Post_ID=identifier).status, 200)
+            self.assertEqual(door.post("/events", body).status, 200)
+        self.assertEqual(doors[0].post("/events", envelope({"n": 2}, client="again")).status, 200)
+        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'again' AND fields->>'n' = '2'", 1)
+        # One with the ID, one that a digest names.
+        self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.events WHERE client_id = 'again' AND fields->>'n' = '1'")), 2)
+        self.assertEqual(self.fleet.query("SELECT count(*) FROM veltra.posts"
+                                          f" WHERE encode(id, 'hex') = '{identifier}'"), [["1"]])
+
+    def test_bodies_larger_than_a_message(self):
+        text = os.urandom(3 << 20).hex()
+        self.assertEqual(self.direct().post("/events", packed(envelope({"t": text}, client="large")), Content_Encoding="gzip").status, 200)
+        self.assertEqual(self.rows("SELECT md5(fields->>'t') FROM veltra.events WHERE client_id = 'large'", 1),
+                         [[hashlib.md5(text.encode()).hexdigest()]])
+        content = os.urandom(5 << 20) + b"end"
+        body = packed(content)
+        answer = self.through().request("POST", "/upload?uuid=ab&sequence=7&description=a%20log&filename=a%20b.gz&raw=true", body, GZIP)
+        self.assertEqual((answer.status, answer.body), (200, b'{"success":true}'))
+        [row] = self.rows("SELECT uuid, sequence, filename, description, encode(sha256, 'hex'), bytes, path FROM veltra.files", 1)
+        self.assertEqual(row[:6], ["ab", "7", "a b.gz", "a log", hashlib.sha256(content).hexdigest(), str(len(content))])
+        self.assertEqual(gzip.decompress((pathlib.Path(self.line["files"]) / row[6]).read_bytes()), content)
+        items = ["a line", {"level": 3, "nul": "\0"}, ["x" * 2_000_000]]
+        answer = self.through().request("POST", "/logdata", plistlib.dumps(items, fmt=plistlib.FMT_BINARY),
+                                        {"Content-Type": "application/octet-stream"})
+        self.assertEqual(answer.status, 200)
+        self.assertRegex(answer.body.decode(), "^/logdata/[0-9a-f]+$")
+        [[found]] = self.rows(f"SELECT items FROM veltra.log_data WHERE location = '{answer.body.decode()}'", 1)
+        self.assertEqual(json.loads(found), ["a line", {"level": 3, "nul": "�"}, ["x" * 2_000_000]])
+
+    def test_datagrams(self):
+        dashboard = Dashboard(self.line["dashboard"])
+        for packet in (datagram(1)[:63], datagram(1, kind=2), datagram(1, length=70), datagram(1, b"x" * 1024), b""):
+            self.assertIsNone(dashboard.ask(packet, 0.3), packet[:8])
+        self.assertIsNone(dashboard.ask(datagram(2, flags=0), 0.3))
+        for _ in range(2):
+            answer = dashboard.ask(packet := datagram(3, b" a=1 b=x\\=y z c=\0", session=77))
+            self.assertTrue(62 <= len(answer) <= 64 and answer[60:62] == packet[60:62], answer)
+        [row] = self.rows("SELECT device_id, sender, session_id, client_version, category, type, event_number, fields "
+                          "FROM veltra.datagrams WHERE session_id = 77", 1)
+        self.assertEqual(row[:7], ["d" * 40, "FU", "77", "3", "5", "10", "3"])
+        self.assertEqual(json.loads(row[7]), {"a": "1", "b": "x=y z", "c": "�"})
+        self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
+
+    def test_storebags_come_from_nginx_alone(self):
+        bag = json.dumps({"version": "1", "release": {}})
+        self.fleet.publish("quindle", bag)
+        door = self.through()
+        first = door.request("GET", "/bags/maple/quindle")
+        self.assertEqual((first.status, first.headers["Cache-Control"]), (200, "max-age=3600"))
+        again = {"If-Modified-Since": first.headers["Last-Modified"]}
+        self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 304)
+        self.fleet.publish("quindle", bag.replace('"1"', '"2"'))
+        self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 200)
+        missing = door.request("GET", "/bags/maple/nothing")
+        self.assertEqual((missing.status, missing.body), (404, b""))
+
+
+class Alone(unittest.TestCase):
+    """A gateway whose stream cannot be reached."""
+
+    def gateway(self, *arguments, hold="0.5"):
+        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", "127.0.0.1:0",
+                                    "--admin", "127.0.0.1:0", "--hold", hold, *arguments], stdout=subprocess.PIPE,
+                                   stderr=subprocess.DEVNULL, text=True)
+        self.addCleanup(process.stdout.close)
+        self.addCleanup(process.wait)
+        self.addCleanup(process.kill)
+        line = json.loads(process.stdout.readline())
+        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1])))
+        self.addCleanup(door.close)
+        return process, door, line
+
+    def test_what_is_held_too_long_is_to_come_again(self):
+        for arguments, status in ((), 429), (("--shed", "503"), 503):
+            process, door, line = self.gateway(*arguments)
+            begin = time.monotonic()
+            answer = door.post("/events", envelope({}))
+            self.assertEqual((answer.status, answer.body), (status, b""))
+            self.assertGreater(int(answer.headers["Retry-After"]), 0)
+            self.assertTrue(0.4 < time.monotonic() - begin < 5)
+            admin = Door(("127.0.0.1", int(line["admin"].rsplit(":", 1)[1])))
+            self.assertEqual([admin.request("GET", path).status for path in ("/live", "/ready", "/x")], [200, 503, 404])
+            admin.close()
+            process.terminate()
+            self.assertEqual(process.wait(15), 0)
+
+    def test_beyond_the_bounds_it_says_so_at_once(self):
+        _, door, line = self.gateway("--hold-messages", "1", hold="5")
+        host, port = door.address
+        with socket.create_connection((host, port)) as waiting:
+            body = envelope({})
+            waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            admin = line["admin"] + "/metrics"
+            side.wait_until(lambda: b"veltra_gateway_held 1" in urllib.request.urlopen(admin).read(), "the first is held")
+            begin = time.monotonic()
+            self.assertEqual(door.post("/events", envelope({"second": 1})).status, 429)
+            self.assertLess(time.monotonic() - begin, 2)
+
+    def test_what_has_begun_is_answered_at_the_end(self):
+        process, door, line = self.gateway(hold="2")
+        with socket.create_connection(door.address) as waiting:
+            body = envelope({})
+            waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            side.wait_until(lambda: b"veltra_gateway_held 1" in urllib.request.urlopen(line["admin"] + "/metrics").read(), "it is held")
+            process.terminate()
+            self.assertTrue(waiting.recv(100).startswith(b"HTTP/1.1 429"))
+        self.assertEqual(process.wait(15), 0)

@@ -1,0 +1,54 @@
+// SPDX-License-Identifier: Apache-2.0
+// What a gzip stream that comes in pieces is found to be.
+#include "support/gunzip.h"
+
+#include <gtest/gtest.h>
+
+#include "support/gzip.h"
+
+namespace veltrad::support {
+namespace {
+
+using State = Gunzip::State;
+
+std::string packed(const std::string& text) {
+  return *GzipCompressor().gzipDeflate({text}, 6);
+}
+
+TEST(Gunzip, TellsWhatAStreamIs) {
+  const std::string text(100'000, 'a');
+  const std::string whole = packed(text);
+  std::string wrongSum = whole;
+  wrongSum[wrongSum.size() - 6] = static_cast<char>(wrongSum[wrongSum.size() - 6] ^ 1);
+  const struct {
+    const char* what;
+    std::string bytes;
+    std::uint64_t most;
+    State state;
+  } rows[] = {
+      {"at the bound", whole, text.size(), State::ended},
+      {"beyond the bound", whole, text.size() - 1, State::tooLarge},
+      {"cut", whole.substr(0, whole.size() - 1), 1 << 20, State::open},
+      {"nothing", "", 1 << 20, State::open},
+      {"a tail", whole + "x", 1 << 20, State::tail},
+      {"a second stream", whole + whole, 1 << 20, State::tail},
+      {"a wrong sum", wrongSum, 1 << 20, State::broken},
+      {"plain text", text, 1 << 20, State::broken},
+  };
+  for (const std::size_t piece : {std::size_t{1}, std::size_t{7}, std::size_t{1} << 20}) {
+    for (const auto& row : rows) {
+      SCOPED_TRACE(std::string(row.what) + ", in pieces of " + std::to_string(piece));
+      Gunzip gunzip(row.most);
+      std::string out;
+      for (std::size_t at = 0; at < row.bytes.size(); at += piece)
+        gunzip.add(std::string_view(row.bytes).substr(at, piece),
+                   [&out](std::string_view more) { out += more; });
+      EXPECT_EQ(gunzip.state(), row.state);
+      if (row.state == State::ended) EXPECT_EQ(out, text);
+      EXPECT_LE(out.size(), row.most);
+    }
+  }
+}
+
+}  // namespace
+}  // namespace veltrad::support

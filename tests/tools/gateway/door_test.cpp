@@ -1,0 +1,109 @@
+// SPDX-License-Identifier: Apache-2.0
+// What a request's head decides, and what a datagram becomes.
+#include <gmock/gmock.h>
+
+#include "formats/json.h"
+#include "gateway/datagram_door.h"
+#include "gateway/door.h"
+
+namespace veltrad::gateway {
+namespace {
+
+struct FakeHead final : RequestHead {
+  std::string verb = "POST", where;
+  std::map<std::string, std::string> fields;
+  std::optional<std::uint64_t> bytes;
+
+  std::string_view method() const override { return verb; }
+  std::string_view target() const override { return where; }
+  std::string_view field(std::string_view name) const override {
+    const auto found = fields.find(std::string(name));
+    return found == fields.end() ? std::string_view() : found->second;
+  }
+  std::optional<std::uint64_t> length() const override { return bytes; }
+};
+
+FakeHead head(std::string target, std::map<std::string, std::string> fields = {}) {
+  FakeHead made;
+  made.where = std::move(target);
+  made.fields = std::move(fields);
+  return made;
+}
+
+int statusOf(const FakeHead& head) {
+  const auto wanted = wantedBy(head, BodyBounds());
+  return wanted ? 200 : wanted.error().status;
+}
+
+TEST(Door, DecidesFromTheHead) {
+  const std::map<std::string, std::string> gzip{{"Content-Encoding", "gzip"}};
+  FakeHead get = head("/events"), large = head("/events"), atBound = head("/events");
+  get.verb = "GET";
+  large.bytes = (16u << 20) + 1;
+  atBound.bytes = 16u << 20;
+  const std::pair<FakeHead, int> rows[] = {
+      {head("/events"), 200},
+      {head("/events?x=1"), 200},
+      {head("/events/v-42"), 200},
+      {head("/events/" + std::string(32, 'a')), 200},
+      {head("/events/" + std::string(33, 'a')), 404},
+      {head("/events/"), 404},
+      {head("/events/A"), 404},
+      {head("/events/a/b"), 404},
+      {head("/eventsx"), 404},
+      {head("/"), 404},
+      {get, 405},
+      {atBound, 200},
+      {large, 413},
+      {head("/events", {{"Content-Type", "application/json; charset=utf-8"}}), 200},
+      {head("/events", {{"Content-Type", "text/plain"}}), 415},
+      {head("/events", {{"Content-Encoding", "br"}}), 415},
+      {head("/logdata", gzip), 200},
+      {head("/upload?uuid=u&sequence=42&filename=a%20b.gz", gzip), 200},
+      {head("/upload?uuid=u&sequence=42&filename=a", {}), 415},
+      {head("/upload?uuid=u", gzip), 400},
+      {head("/upload?sequence=4294967296", gzip), 400},
+      {head("/upload?sequence=1&filename=%ff", gzip), 400},
+      {head("/upload?sequence=1&filename=%2", gzip), 400},
+      {head("/upload?sequence=1&filename=%00", gzip), 400},
+      {head("/upload?sequence=1&filename=" + std::string(1'025, 'a'), gzip), 400},
+  };
+  for (const auto& [request, status] : rows) EXPECT_EQ(statusOf(request), status) << request.where;
+}
+
+TEST(Door, ReadsWhatTheRequestSays) {
+  const std::string id(32, 'a');
+  const auto events = wantedBy(head("/events/v42?x", {{"X-VLT-Post-ID", id}}), BodyBounds());
+  EXPECT_EQ(events.value().via, "v42");
+  EXPECT_EQ(events.value().postID, id);
+  EXPECT_EQ(wantedBy(head("/events", {{"X-VLT-Post-ID", "A" + id}}), BodyBounds()).value().postID, "");
+  const auto file =
+      wantedBy(head("/upload?uuid=&sequence=7&description=Callwyn%20QBSL&filename=a%20b.gz&raw=true",
+                    {{"Content-Encoding", "gzip"}}),
+               BodyBounds());
+  EXPECT_EQ(file.value().query.at("filename"), "a b.gz");
+  EXPECT_EQ(file.value().query.at("description"), "Callwyn QBSL");
+}
+
+TEST(Datagrams, BecomeTheSameMessageWheneverTheyAreSent) {
+  // Version 2, component 6, kind 1, 123456 µs; 1400000000 s; session 4660, client 3; 20 bytes of text; 5/10;
+  // number 7, reliable.
+  std::string packet("\x02\x06\x01\x1e\x53\x72\x4e\x00\xff\xff\xed\xcb\xff\xfc\xff\xab\x00\x05\x00\x0a", 20);
+  packet += std::string(40, 'd');
+  packet += std::string("\x00\x07\x00\x01", 4);
+  packet += " a=1 b=x\\=y c=z z d=";
+  const Message message = messageOfDatagram(packet);
+  EXPECT_EQ(message.id, messageOfDatagram(packet).id);
+  EXPECT_NE(message.id, messageOfDatagram(packet + "x").id);
+  const Value value = formats::parseJSON(message.body).value();
+  const Dictionary& fields = *value.asDictionary();
+  EXPECT_EQ(*fields.string("sender"), "FU");
+  EXPECT_EQ(*fields.string("deviceID"), std::string(40, 'd'));
+  EXPECT_EQ(fields.uint32("sessionID"), 4660u);
+  EXPECT_EQ(fields.uint32("eventNumber"), 7u);
+  EXPECT_EQ(fields.real("time"), 1400000000.12);
+  EXPECT_EQ(*fields.dictionary("fields"), (Dictionary{{"a", "1"}, {"b", "x=y"}, {"c", "z z"}, {"d", ""}}));
+}
+
+}  // namespace
+}  // namespace veltrad::gateway
