@@ -88,8 +88,8 @@ TEST(StorebagVerdict, NamesTheRuleThatABagBreaks) {
   const auto revoking = [](const std::string& key) { return saying({{"revoked", Array{key}}}); };
   struct Case {
     Dictionary bag;
-    const config::StorebagSigners& signers;
-    const config::SeenStorebags& seen;
+    config::StorebagSigners signers;
+    config::SeenStorebags seen;
     std::optional<Reason> reason;
     const char* text;
   };
