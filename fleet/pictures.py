@@ -57,7 +57,7 @@ def panel(one, y, hours, shades, top):
         at = floor - one["mean"] / top * PLOT
         parts.append(f'<line class="mean" x1="{LEFT}" x2="{WIDTH - RIGHT}" y1="{at:.1f}" y2="{at:.1f}"/>')
     for place, name in enumerate(one.get("names", ())):
-        x = WIDTH - RIGHT - 118 * (len(one["names"]) - place)
+        x = WIDTH - RIGHT - 96 * (len(one["names"]) - place)
         parts += [f'<rect x="{x}" y="{y + 7}" width="10" height="10" fill="{COLOURS[place]}"/>', text(x + 15, y + 16, name, "small")]
     return parts
 

@@ -52,6 +52,11 @@ void Fleet::settle(std::uint32_t index) {
   }
   planNext(index, Kind::message, scenario.messagesPerHour);
   planNext(index, Kind::sessionBegins, scenario.sessionsPerHour);
+  if (_world.dice.chance(scenario.sessionsPerHour * scenario.sessionSeconds / kHour)) {  // one is on its way
+    const bool reports = _sampling.reports(device, _sampling.nextFactor(index));
+    _world.calendar.addIn(_world.dice.uniform() * scenario.sessionSeconds,
+                          _world.eventFor(index, Kind::sessionEnds, reports));
+  }
   if (scenario.settings.storebags.follow) _storebags.follow(index);
 }
 
