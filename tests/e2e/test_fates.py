@@ -74,6 +74,15 @@ class Fates(FatesTest):
                 self.assertIn(part, text)
             self.assertEqual(self.ctl("why", "--client", "nobody", "--json")[0], "")
 
+    def test_a_field_that_the_user_info_has_lost_leaves_the_messages_own_hashed(self):
+        self.root.write("etc/veltrad/policy.json", b'{"hash": ["room"]}')
+        self.serve(entry())
+        with self.serving():
+            self.client(requireUserInfo=True, user_info={"room": [1]}).message(room="r")
+            self.assertRegex(self.lab.wait_for_events(1, _method=5)[0]["room"], "^[0-9a-f]{64}$")
+            told = [line["backends"]["httppost"] for line in self.why()]
+            self.assertEqual([(one["removed"], one["hashed"]) for one in told], [(["room"], []), ([], ["room"])])
+
     def test_what_the_ring_has_overwritten_is_said_and_all_are_accounted_for(self):
         self.root.write("etc/veltrad/settings.json", b'{"fates": {"bytes": 65536}}')
         self.serve(entry(sampling_threshold=-1, override_sampling=-1))

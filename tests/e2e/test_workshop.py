@@ -174,6 +174,22 @@ class Workshop(unittest.TestCase):
         told = json.loads(run("explain", "--json", bare, "--client-type", 7, "--country", "us", "--require-user-info", "--client", "x")[1])
         self.assertEqual(told["backends"]["httppost"]["reason"], "reports")
 
+    def test_what_was_removed_or_hashed(self):
+        """As each event leaves: the user info takes the place of the message's fields, and filters come last."""
+        for policy, key, action, given, info, removed, hashed in (
+                ({}, "a", "sha256", "x", 7, [], ["a"]), ({}, "a", "sha256", [1], None, ["a"], []),
+                ({"hash": ["A"]}, "a", "keep", [1], None, ["a"], []), ({"hash": ["A"]}, "a", "keep", [1], 7, [], ["a"]),
+                ({"hash": ["A"]}, "a", "remove", "x", None, ["a"], []), ({"hash": ["A"]}, "a", "sha256", "x", None, [], ["a"]),
+                ({}, "_sender", "sha256", [1], None, [], ["_sender"]),
+                ({"remove": ["_sender"]}, "_sender", "sha256", "x", None, [], ["_sender"])):
+            with self.subTest(policy=policy, key=key, action=action, given=given, info=info):
+                played = self.file("bag", bag(filters=[{"key": key, "action": action}])), self.file("policy.json", policy)
+                told = json.loads(run("explain", "--json", played[0], "--policy", played[1], "--client-type", 7, "--country", "US",
+                                      "--require-user-info", "--client", "x", *(("--user-info", f"a={info}") if info else ()),
+                                      "--category", 5, "--type", 2, "--payload", self.file("payload", {key: given}))[1])
+                post = told["backends"]["httppost"]
+                self.assertEqual((post["removed"], post["hashed"], key in post["events"][1]), (removed, hashed, bool(hashed)))
+
     def edited(self, storebag, edits):
         """The storebag with other values; numbers among "clients" stand for its entries."""
         entries = storebag["release"]["httppost"]["clients"]
