@@ -92,14 +92,14 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 }
 
 void VeltradSession::hearOwner() {
-  while (_word.hear()) {
+  _word.hear([this] {
     _fates.forget();
     _word.takeIdentity(_services.device, _deviceid, _backends.get());
     _userInfo = _word.allowed(_userInfo.given);
-    if (!_backends) continue;
+    if (!_backends) return;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
     _leftFamily ? forbidByWord(*_backends, _word.now()) : updateSessionWithDefaultSessionInfo();
-  }
+  });
 }
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
@@ -124,9 +124,11 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
 void VeltradSession::takeNews() {
   hearOwner();
   auto now = _backends ? _sessionDelegate.storebagNow(*this) : std::nullopt;
-  if (!now || !_storebag.follow(std::move(*now), _sessionID)) return;
-  createBackends(_backends.get());
-  updateSessionWithDefaultSessionInfo();
+  if (!now) return;
+  _storebag.follow(std::move(*now), _sessionID, [this] {
+    createBackends(_backends.get());
+    updateSessionWithDefaultSessionInfo();
+  });
 }
 
 void VeltradSession::createBackends(const BackendSet* before) {
@@ -223,11 +225,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary 
                                                                      wire::Outcomes* outcomes) {
   const auto category = given.uint16(wire::kVeltraMessageParametersCategory);
   const auto type = given.uint16(wire::kVeltraMessageParametersType);
-  Message message{given.takeDictionary(wire::kVeltraMessageParametersPayload),
-                  {},
-                  category.value_or(0),
-                  type.value_or(0),
-                  given.int32(wire::kVeltraMessageParametersFlag).value_or(0)};
+  Message message = messageOf(std::move(given));
   if (!hasBackends(message, Origin::client)) return std::nullopt;
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
