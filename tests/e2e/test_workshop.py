@@ -119,10 +119,10 @@ class Workshop(unittest.TestCase):
     def test_schema(self):
         schema = json.loads(run("schema")[1])
         good = (bag(), bag(client="a,b c", override_dnu=True, per_country_sampling_thresholds=[{"country": ["US"], "threshold": 1}]),
-                {"version": "1", "release": {"dashboard": {"ip": "10.0.0.1", "port": 1, "reliable": 50}, "ampery": {}}})
+                {"version": "1", "release": {"dashboard": {"ip": "10.0.0.1", "port": 1, "reliable": 50}, "ampery": {"active": True}}})
         bad = (bag(sampling_threshold=2), bag(client="a, b"), bag(filters=[{"key": "a"}]), bag(post_url="http://a"), bag(surprise=1),
                bag(locale_whitelist=[]), {"release": {}}, {"version": "1", "release": {"dashboard": {"ip": "name", "port": 1}}},
-               bag(filters=[{"key": "a ", "action": "remove"}]))
+               bag(filters=[{"key": "a ", "action": "remove"}]), {"version": "1", "release": {"ampery": {"surprise": 1}}})
         done = subprocess.run(["node", "-e", VALIDATOR], env=NODE, input=json.dumps({"schema": schema, "bags": good + bad}),
                               capture_output=True, text=True)
         self.assertEqual((done.returncode, done.stderr), (0, ""))
