@@ -266,16 +266,16 @@ std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Ou
   const config::EditedFields edits = _word.restrict(message.payload);
   message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
-  fates().taken(message, origin, &edits,
-                _backends->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt);
   sayWithoutUserInfo();
+  CopySent copy;
   const std::int32_t hierarchy = hierarchyOf(_backends.get());
   if (hierarchy > 0 || _aggregation->active()) {
-    const CopySent sent = sendCopy(
-        {_sessionDelegate, *_aggregation, _sessionIDString, _sessionInfo, _userInfo}, hierarchy, message);
-    if (sent.line) logError("%s", sent.line->c_str());
-    if (!sent.to.empty()) _fates.aggregated(message, sent.to);
+    copy = sendCopy({_sessionDelegate, *_aggregation, _sessionIDString, _sessionInfo, _userInfo}, hierarchy,
+                    message);
+    if (copy.line) logError("%s", copy.line->c_str());
   }
+  fates().taken(message, origin, &edits,
+                _backends->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt, copy.to);
   return offerToBackends(*_backends, std::move(message), _services.messageLog, outcomes);
 }
 

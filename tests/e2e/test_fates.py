@@ -12,6 +12,7 @@ import subprocess
 import tempfile
 
 from harness import Process, Wire, program, storebag, wait_until
+from test_family import Member
 from test_https import HTTPSTest, entry
 
 MESSAGES = int(os.environ.get("VELTRA_FATES", "300"))
@@ -99,19 +100,22 @@ class Fates(FatesTest):
 
     def test_watch_tells_each_message_and_step_as_it_happens(self):
         self.serve(entry())
-        with self.serving():
-            session = self.client(requireUserInfo=True)
+        with self.serving("The client has gone."):
+            session = Member(self.root, 7, aggregates=True, service="phone")
+            self.addCleanup(session.close)
             watch = self.watch("--category", "7")
             def told():
                 """The steps of a message that was told of and answered."""
                 session.message(category=7)
                 for first in self.lines(watch, "message"):
-                    self.assertEqual((first["client"], "backends" in first, "payload" in first), ("phone", False, False))
+                    self.assertEqual((first["client"], first["aggregatedTo"], "backends" in first, "payload" in first),
+                                     ("phone", first["session"], False, False))
                     steps = [line["step"] for line in self.lines(watch, "step") if line["message"] == first["message"]]
                     if "answered" in steps:
                         return steps
                 return None
-            self.assertEqual(wait_until(told, "a message and its answer"), ["posted", "answered"])
+            self.assertEqual(wait_until(told, "a message and its answer"), ["aggregated", "posted", "answered"])
+            self.assertTrue(all(line["aggregatedTo"] == line["session"] for line in self.why("--category", "7")))
             watch.popen.send_signal(signal.SIGTERM)
             self.assertEqual(watch.end(), 0)
 
@@ -198,6 +202,9 @@ class Fates(FatesTest):
             nowhere.call(ONE_SHOT, category=7, type=8, payload=values, userInfo={"clientName": "lamp", "serviceName": "hidden-service"},
                          sessionInfo={"clientType": 7, "sessionID": 5, "requireUserInfo": True})
             lines = wait_until(lambda: (found := self.lines(watch, "message"))[-1]["type"] == 8 and found, "the last message")
+            shown = [one for one in json.loads(self.ctl("status", "--json")[0])["sessions"] if one["clientType"] == 7]
+            self.assertIn(("phone", None), [(one["clientName"], one["serviceName"]) for one in shown])
+            self.assertNotIn("hidden", str(shown))
         for line in lines:
             self.assertRegex(line["payload"].pop("number"), "^[0-9a-f]{64}$")
             self.assertEqual(line["payload"], {"kept": values["kept"]})
