@@ -153,6 +153,8 @@ class Workshop(unittest.TestCase):
         status, _, error = run("test", self.file("suite", suite))
         self.assertEqual(status, 1)
         self.assertRegex(error, r'suite:1:\d+: unknown key "clientTyp" in "given": did you mean "clientType"')
+        suite["cases"] = [{"given": {"clientType": 7}, "expect": {"htppost": {"absent": ["peer"]}}}]
+        self.assertIn('unknown back end "htppost": did you mean "httppost"?', run("test", self.file("suite", suite))[2])
 
 
     def test_what_is_played_is_checked(self):
