@@ -38,16 +38,15 @@ Value textOrNull(const std::string* text) {
   return withoutIncompleteEnd(std::string_view(*text).substr(0, kLongestText));
 }
 
-Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now) {
+Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now, double jitter) {
   const bool attempted = record.attempted;
-  const double wait = record.fetchSuccessful ? record.maxAge : kSecondsBetweenAttempts;
   return {{"name", name},
           {"version", textOrNull(record.version ? &*record.version : nullptr)},
           {"age", attempted ? std::abs(now - record.fetchTime) : kNotKnown},
           {"state", !attempted               ? "never"
                     : record.fetchSuccessful ? "successful"
                                              : "failed"},
-          {"nextAttempt", attempted ? record.fetchTime + wait : kNotKnown},
+          {"nextAttempt", attempted ? record.fetchTime + record.wait(jitter) : kNotKnown},
           {"refusal", textOrNull(record.refusal.empty() ? nullptr : &record.refusal)}};
 }
 
@@ -127,7 +126,9 @@ Array statusOfStorebags(StorebagCache& cache, double now) {
   auto records = cache.records();
   for (const std::string& name : config::storebagNames()) records.try_emplace(name);
   Array storebags;
-  for (const auto& [name, record] : records) storebags.push_back(statusOfStorebag(name.c_str(), record, now));
+  const double jitter = cache.jitter();
+  for (const auto& [name, record] : records)
+    storebags.push_back(statusOfStorebag(name.c_str(), record, now, jitter));
   return storebags;
 }
 
