@@ -123,6 +123,16 @@ class Doors(FleetTest):
         self.assertEqual(json.loads(row[7]), {"a": "1", "b": "x=y z", "c": "�"})
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
 
+    def test_storebags_go_back(self):
+        door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
+        self.fleet.publish("ostvane", bags[0])
+        first = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.publish("ostvane", bags[1])
+        second = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.storebag("rollback", "ostvane", "bags")
+        back = door.request("GET", "/bags/maple/ostvane", headers={"If-Modified-Since": second.headers["Last-Modified"]})
+        self.assertEqual((back.status, back.body), (200, first.body))
+
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
         self.fleet.publish("quindle", bag)
