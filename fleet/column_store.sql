@@ -3,11 +3,11 @@
 -- written twice is merged, because a row is named by (received, seq, index): at least once is enough. To carry over what is new,
 -- from cron:
 --
---   LAST=$(clickhouse-client --query 'SELECT max(received) FROM veltra.events')
+--   LAST=$(clickhouse-client --query 'SELECT toUInt32(max(received)) FROM veltra.events')
 --   psql -qAt -c "COPY (SELECT to_char(received AT TIME ZONE 'UTC', 'YYYY-MM-DD HH24:MI:SS'), seq, index, client_id, coalesce(sender, ''),
 --       coalesce(session_id, ''), coalesce(category, -1), coalesce(type, -1), coalesce(event_number, -1), coalesce(via, ''),
 --       to_char(happened AT TIME ZONE 'UTC', 'YYYY-MM-DD HH24:MI:SS'), fields
---       FROM veltra.events WHERE received >= timestamptz '$LAST UTC' - interval '10 minutes') TO STDOUT (FORMAT csv, NULL '\N')" |
+--       FROM veltra.events WHERE received >= to_timestamp($LAST) - interval '10 minutes') TO STDOUT (FORMAT csv, NULL '\N')" |
 --     clickhouse-client --query 'INSERT INTO veltra.events FORMAT CSV'
 --
 -- The ten minutes are for the stream's servers: their clocks differ, and one takes the place of another. An event without a number
