@@ -1,14 +1,17 @@
 -- SPDX-License-Identifier: Apache-2.0
--- The tables that `veltra-gateway drain` fills. It runs this file at each start; every statement may be repeated.
+-- The tables that `veltra-gateway drain` fills. It runs this file at its start, unless the schema's comment says that it has done
+-- so; every statement may be repeated.
 -- "received" is the time at which the stream took a message; "seq" is the message's place in the stream.
 CREATE SCHEMA IF NOT EXISTS veltra;
 
 -- How far each stream has been read: everything up to "seq" is in the tables. "created" tells a stream that was made anew
--- (nanoseconds since 1970).
+-- (nanoseconds since 1970), "time" is that of the message at "seq": a stream that has lost its newest messages gives other ones
+-- their places.
 CREATE TABLE IF NOT EXISTS veltra.position (
   stream text PRIMARY KEY,
   created bigint NOT NULL,
-  seq bigint NOT NULL
+  seq bigint NOT NULL,
+  time bigint NOT NULL DEFAULT 0
 );
 
 -- The IDs that devices gave their posts. A post whose ID stands here is not written again.
@@ -77,7 +80,8 @@ CREATE TABLE IF NOT EXISTS veltra.log_data (
 );
 CREATE INDEX IF NOT EXISTS log_data_location ON veltra.log_data (location);
 
--- What gateways refused as malformed: a sample, at most ten a second of each gateway, cut after 64 KiB.
+-- What gateways refused as malformed: a sample, at most ten a second of each gateway, cut after 64 KiB. The drain keeps it for
+-- seven days.
 CREATE TABLE IF NOT EXISTS veltra.refused (
   received timestamptz NOT NULL,
   seq bigint NOT NULL,
@@ -85,28 +89,41 @@ CREATE TABLE IF NOT EXISTS veltra.refused (
   body bytea NOT NULL
 );
 
--- Events are partitioned by days (UTC). The drain calls this for each day before it writes the first event of it.
+-- Events are partitioned by days (UTC). The drain calls this for each day before it writes the first event of it. A table that is
+-- attached, unlike one that is made as a partition, does not wait for queries of the others.
 CREATE OR REPLACE FUNCTION veltra.partition_for(day date) RETURNS void LANGUAGE plpgsql AS $$
+DECLARE
+  part text := 'events_' || to_char(day, 'YYYYMMDD');
 BEGIN
-  EXECUTE format('CREATE TABLE IF NOT EXISTS veltra.%I PARTITION OF veltra.events FOR VALUES FROM (%L) TO (%L)',
-                 'events_' || to_char(day, 'YYYYMMDD'), day || ' 00:00:00+00', (day + 1) || ' 00:00:00+00');
+  IF to_regclass('veltra.' || part) IS NOT NULL THEN
+    RETURN;
+  END IF;
+  EXECUTE format('CREATE TABLE veltra.%I (LIKE veltra.events INCLUDING ALL)', part);
+  EXECUTE format('ALTER TABLE veltra.events ATTACH PARTITION veltra.%I FOR VALUES FROM (%L) TO (%L)',
+                 part, day || ' 00:00:00+00', (day + 1) || ' 00:00:00+00');
 END $$;
 
--- Retention. Drops whole days of events and deletes the other rows that are older; returns what it dropped. The files of
--- deleted rows stay in their folder, which has a folder for each day.
+-- Retention. Deletes rows that are older and drops whole days of events; returns what it dropped. A day that a query keeps from
+-- being dropped for three seconds stays until the next time. The drain
+-- removes the files of deleted rows with --keep-days alone; there is a folder for each day.
 CREATE OR REPLACE FUNCTION veltra.forget(older_than interval) RETURNS SETOF text LANGUAGE plpgsql AS $$
 DECLARE
   part text;
   name text;
 BEGIN
+  FOREACH name IN ARRAY ARRAY['datagrams', 'files', 'log_data', 'refused'] LOOP
+    EXECUTE format('DELETE FROM veltra.%I WHERE received < $1', name) USING now() - older_than;
+  END LOOP;
+  PERFORM set_config('lock_timeout', '3s', true);
   FOR part IN SELECT c.relname FROM pg_inherits i JOIN pg_class c ON c.oid = i.inhrelid
               WHERE i.inhparent = 'veltra.events'::regclass
                 AND to_date(right(c.relname, 8), 'YYYYMMDD') + 1 <= (now() - older_than) AT TIME ZONE 'UTC' LOOP
-    EXECUTE format('DROP TABLE veltra.%I', part);
-    RETURN NEXT part;
-  END LOOP;
-  FOREACH name IN ARRAY ARRAY['datagrams', 'files', 'log_data', 'refused'] LOOP
-    EXECUTE format('DELETE FROM veltra.%I WHERE received < $1', name) USING now() - older_than;
+    BEGIN
+      EXECUTE format('DROP TABLE veltra.%I', part);
+      RETURN NEXT part;
+    EXCEPTION WHEN lock_not_available THEN
+      NULL;
+    END;
   END LOOP;
 END $$;
 

@@ -123,6 +123,7 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
   EXPECT_GE(time(), firstTime + std::chrono::seconds(1)) << "a daemon that has the first would get 304";
   const std::string second = read("served/quindle");
   EXPECT_NE(first, second);
+  ASSERT_TRUE(publish(path("quindle")).done) << "the same again";
 
   std::filesystem::create_directories(path("broken"));
   std::string broken = second;
