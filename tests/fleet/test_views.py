@@ -2,6 +2,12 @@
 """What the views answer about rows that are known."""
 import itertools
 import json
+import os
+import pathlib
+import shutil
+import subprocess
+import tempfile
+import unittest
 
 import side
 from devices import FleetTest
@@ -9,6 +15,9 @@ from devices import FleetTest
 PLACES = itertools.count(1)
 START = 1772366400  # 2026-03-01 12:00 UTC, after the first day that is kept begins
 STOP = {"category": 0, "type": 1}
+COLUMN_STORE = """<yandex><tcp_port>{1}</tcp_port><listen_host>127.0.0.1</listen_host><path>{0}/</path><tmp_path>{0}/tmp/</tmp_path>
+<logger><level>none</level><log>{0}/log</log><errorlog>{0}/log</errorlog></logger><users_config>/etc/clickhouse-server/users.xml</users_config>
+<default_profile>default</default_profile><default_database>default</default_database><mark_cache_size>16777216</mark_cache_size></yandex>"""
 
 
 def row(received, client="c", session=None, **columns):
@@ -106,3 +115,31 @@ class Views(FleetTest):
         columns = "to_char(hour AT TIME ZONE 'UTC', 'HH24'), coalesce(via, '-'), coalesce(library, '-'), clients, sessions, events"
         self.assertEqual(self.answer("storebag_versions", columns, rows), [
             "10 main-v42 8.0 3 3 6", "11 main-v42 8.0 2 2 4", "11 main-v43 8.0 2 2 4", "12 - - 1 0 1", "12 main-v43 8.0 3 3 6"])
+
+    @unittest.skipUnless(shutil.which("clickhouse-server"), "clickhouse-server is not installed")
+    def test_column_store(self):
+        folder = tempfile.TemporaryDirectory()
+        self.addCleanup(folder.cleanup)
+        [port] = side.free_ports(1)
+        configuration = pathlib.Path(folder.name) / "config.xml"
+        configuration.write_text(COLUMN_STORE.format(folder.name, port))
+        server = subprocess.Popen(["clickhouse-server", f"--config-file={configuration}"], stdout=subprocess.DEVNULL,
+                                  stderr=subprocess.DEVNULL, env={**os.environ, "TZ": "Asia/Kolkata"})
+        self.addCleanup(server.wait)
+        self.addCleanup(server.kill)
+        side.wait_until(lambda: side.connects(port), "the column store")
+        text = (side.HERE / "column_store.sql").read_text()
+        client = f"clickhouse-client --host 127.0.0.1 --port {port}"
+        side.run(*client.split(), "--multiquery", "--query", "".join(f"{line}\n" for line in text.splitlines() if not line.startswith("--")))
+        carry = "\n".join(line[4:] for line in text.splitlines() if line.startswith("--   "))
+        carry = carry.replace("clickhouse-client", client).replace("psql ", f"psql -d '{self.fleet.dsn}' ")
+
+        def carried(rows):
+            self.answer("events_by_hour", "1", rows, "1")
+            side.run("bash", "-e", "-o", "pipefail", "-c", carry)
+            return side.run(*client.split(), "--query", "SELECT client_id, received, happened, type, fields FROM veltra.events FINAL "
+                            "ORDER BY received FORMAT CSV").splitlines()
+        first = row("2026-03-01 23:59:59.5", "a", type=1, happened="2026-03-01 23:00+00", Text="it's, \n")
+        anew = {**row("2026-03-02 00:30", "b"), "seq": 0}  # of a stream that was made anew
+        lines = ['"a","2026-03-01 23:59:59","2026-03-01 23:00:00",1,"{""Text"": ""it\'s, \\n""}"', '"b","2026-03-02 00:30:00",\\N,-1,"{}"']
+        self.assertEqual([carried([first]), carried([anew]), carried([])], [lines[:1], lines, lines])
