@@ -21,6 +21,9 @@ if(NOT CMAKE_BUILD_TYPE STREQUAL "Debug")
   # matching prefixes GCC replaces the one that was given last.
   target_compile_options(veltra_options INTERFACE
     -ffile-prefix-map=${PROJECT_SOURCE_DIR}=. -ffile-prefix-map=${PROJECT_BINARY_DIR}=build)
+  # The linker drops the functions that a program does not use; they would be resident beside those that it does.
+  target_compile_options(veltra_options INTERFACE -ffunction-sections -fdata-sections)
+  target_link_options(veltra_options INTERFACE -Wl,--gc-sections)
 endif()
 if(VELTRA_SANITIZE)
   target_compile_options(veltra_options INTERFACE -fsanitize=${VELTRA_SANITIZE} -fno-sanitize-recover=all -O1 -g1)

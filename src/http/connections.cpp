@@ -2,6 +2,7 @@
 // The sockets of libcurl's connections, and the certificates that they trust.
 #include "http/connections.h"
 
+#include <dirent.h>
 #include <netinet/in.h>
 #include <openssl/err.h>
 #include <openssl/x509.h>
@@ -11,7 +12,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <memory>
 #include <new>
+#include <string_view>
 #include <utility>
 
 #include "platform/log.h"
@@ -45,6 +48,16 @@ bool shortageInErrorQueue() {
         found || (ERR_SYSTEM_ERROR(error) ? platform::isShortage(reason) : reason == ERR_R_MALLOC_FAILURE);
   }
   return found;
+}
+
+// Whether `c_rehash` or its like has made the links by which OpenSSL finds a certificate of the directory.
+bool isHashed(const char* directory) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(directory), closedir);
+  while (const dirent* entry = entries ? readdir(entries.get()) : nullptr) {
+    const std::string_view name = entry->d_name;
+    if (name.size() > 9 && name[8] == '.' && name.find_first_not_of("0123456789abcdef") == 8) return true;
+  }
+  return false;
 }
 
 }  // namespace
@@ -112,9 +125,12 @@ Connections::Store Connections::makeStore(bool withExtra) const {
   if (!store) return store;
   // The same flags as libcurl sets: a trusted certificate ends the chain, whoever issued it.
   X509_STORE_set_flags(store.get(), X509_V_FLAG_TRUSTED_FIRST | X509_V_FLAG_PARTIAL_CHAIN);
-  X509_STORE_load_path(store.get(), X509_get_default_cert_dir());
+  // A hashed directory is read one certificate at a time, as handshakes ask; a bundle costs more than a MiB
+  // at once.
+  const char* directory = X509_get_default_cert_dir();
   const char* bundle = X509_get_default_cert_file();  // does not exist on every system
-  if (access(bundle, R_OK) == 0) X509_STORE_load_file(store.get(), bundle);
+  X509_STORE_load_path(store.get(), directory);
+  if (!isHashed(directory) && access(bundle, R_OK) == 0) X509_STORE_load_file(store.get(), bundle);
   if (shortageInErrorQueue()) return nullptr;
   if (!withExtra || X509_STORE_load_file(store.get(), _extraCertificatesPath.c_str()) == 1) return store;
   const char* reason = ERR_reason_error_string(ERR_peek_last_error());
