@@ -8,6 +8,7 @@ import pathlib
 import plistlib
 import socket
 import subprocess
+import tempfile
 import time
 import unittest
 import urllib.request
@@ -49,7 +50,9 @@ class Doors(FleetTest):
                     self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
                     if where == "direct":
                         self.assertTrue(answer.headers["X-VLT-Refused"])
-            self.assertIn(door.request("GET", "/events").status, (403, 405))
+            for path in ("/events", "/upload", "/logdata"):
+                answer = door.request("GET", path)
+                self.assertEqual((answer.status, answer.body, answer.headers["Allow"]), (405, b"", "POST"))
             door.close()
             large = door.request("POST", "/events", good, {**JSON, "X-Large": "x" * 65536})
             self.assertIn(large.status, (400, 431))
@@ -122,6 +125,18 @@ class Doors(FleetTest):
         self.assertEqual(row[:7], ["d" * 40, "FU", "77", "3", "5", "10", "3"])
         self.assertEqual(json.loads(row[7]), {"a": "1", "b": "x=y z", "c": "�"})
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
+        self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
+        self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
+
+    def test_storebags_go_back(self):
+        door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
+        self.fleet.publish("ostvane", bags[0])
+        first = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.publish("ostvane", bags[1])
+        second = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.storebag("rollback", "ostvane", "bags")
+        back = door.request("GET", "/bags/maple/ostvane", headers={"If-Modified-Since": second.headers["Last-Modified"]})
+        self.assertEqual((back.status, back.body), (200, first.body))
 
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
@@ -133,23 +148,44 @@ class Doors(FleetTest):
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 304)
         self.fleet.publish("quindle", bag.replace('"1"', '"2"'))
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 200)
-        missing = door.request("GET", "/bags/maple/nothing")
-        self.assertEqual((missing.status, missing.body), (404, b""))
+        for path in ("nothing", "", ".before/quindle/1", "quindle/x"):
+            missing = door.request("GET", "/bags/maple/" + path)
+            self.assertEqual((missing.status, missing.body), (404, b""), path)
 
 
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
 
-    def gateway(self, *arguments, hold="0.5"):
-        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", "127.0.0.1:0",
+    def test_listens_on_a_socket_that_others_may_use(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder) / "gateway.sock"
+            with socket.socket(socket.AF_UNIX) as left:
+                left.bind(str(path))  # as a gateway that was killed leaves it
+            process, _, _ = self.gateway(listen=f"unix:{path}")
+            self.assertEqual(path.stat().st_mode & 0o777, 0o666)
+            with socket.socket(socket.AF_UNIX) as link:
+                link.connect(str(path))
+                link.sendall(b"GET /events HTTP/1.1\r\nHost: h\r\n\r\n")
+                self.assertTrue(link.recv(1000).startswith(b"HTTP/1.1 405"))
+            process.terminate()
+            self.assertEqual(process.wait(15), 0)
+            self.assertFalse(path.exists())
+            path.write_text("not a socket")
+            refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
+                                     capture_output=True, text=True)
+            self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
+
+    def gateway(self, *arguments, hold="0.5", listen="127.0.0.1:0"):
+        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", listen,
                                     "--admin", "127.0.0.1:0", "--hold", hold, *arguments], stdout=subprocess.PIPE,
                                    stderr=subprocess.DEVNULL, text=True)
         self.addCleanup(process.stdout.close)
         self.addCleanup(process.wait)
         self.addCleanup(process.kill)
         line = json.loads(process.stdout.readline())
-        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1])))
-        self.addCleanup(door.close)
+        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1]))) if line["listen"].startswith("http") else None
+        if door:
+            self.addCleanup(door.close)
         return process, door, line
 
     def test_what_is_held_too_long_is_to_come_again(self):

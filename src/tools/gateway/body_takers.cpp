@@ -4,6 +4,8 @@
 
 #include <fmt/format.h>
 
+#include <algorithm>
+
 #include "base/property_list.h"
 #include "base/text.h"
 #include "formats/json.h"
@@ -19,8 +21,8 @@ namespace {
 
 constexpr PropertyListLimits kLogDataLimits{32u << 20, 64, 500'000, 32u << 20};
 constexpr std::size_t kLocationDigits = 32;
-// What a file keeps in memory besides what the publisher holds.
-constexpr std::uint64_t kFileBytes = 2 * kPieceBytes;
+// What a file keeps in memory at most: pieces under way, and the next one.
+constexpr std::uint64_t kMostFileBytes = 5 * kPieceBytes;
 
 using Answering = std::function<void(Answer)>;
 
@@ -28,6 +30,15 @@ using Answering = std::function<void(Answer)>;
 void identify(Message& message, const Wanted& wanted, std::string digest) {
   message.id = wanted.postID.empty() ? std::move(digest) : wanted.postID;
   if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
+}
+
+// Servers look for a header's name in the whole text of all, so no other one may hold what begins like
+// theirs.
+std::string headerText(const Dictionary& fields) {
+  std::string text = formats::writeJSON(fields);
+  for (std::size_t at = text.find("Nats-"); at != std::string::npos; at = text.find("Nats-", at))
+    text.replace(at, 1, "\\u004e");
+  return text;
 }
 
 // What becomes of the request: `answer` if the stream has taken the message.
@@ -90,9 +101,14 @@ class LogDataTaker final : public BodyTaker {
       return answering(_services.refusals.malformed("log_data", list.error().description(), _body.text()));
     if (!list.value().asArray())
       return answering(_services.refusals.malformed("log_data", "it is no array", _body.text()));
+    std::string text = formats::writeJSON(list.value());
+    if (text.size() > _services.bounds.logData)
+      return answering(_services.refusals.answer({413, "too_large",
+                                                  fmt::format("as JSON it has {} bytes, at most {} are taken",
+                                                              text.size(), _services.bounds.logData)}));
     std::string digest = digestOf(_wanted.path, _body.text());
     const std::string location = "/logdata/" + digest.substr(0, kLocationDigits);
-    Message message{subject::kLogData, "", {{header::kLocation, location}}, formats::writeJSON(list.value())};
+    Message message{subject::kLogData, "", {{header::kLocation, location}}, std::move(text)};
     identify(message, _wanted, std::move(digest));
     publishWhole(_services.publisher, std::move(message),
                  answeringWith(_services, Answer{200, location, "text/plain", {}}, _services.metrics.logData,
@@ -114,15 +130,17 @@ class FileTaker final : public BodyTaker {
         _wanted(std::move(wanted)),
         _gunzip(services.bounds.unpackedFile),
         _pieces(services.publisher),
-        _charged(services.budget.take(kFileBytes)) {
+        _bytes(std::min(_wanted.length.value_or(kMostFileBytes), kMostFileBytes)),
+        _charged(services.fileBudget.take(_bytes)) {
     _message.add(_wanted.path);
   }
   ~FileTaker() override {
-    if (_charged) _services.budget.give(kFileBytes);
+    if (_charged) _services.fileBudget.give(_bytes);
   }
 
   std::optional<Answer> take(std::string_view bytes) override {
     if (!_charged) return _services.refusals.busy("no_room");
+    if (_pieces.outcome() != Outcome::taken) return _services.refusals.busy("piece_not_taken");
     _received += bytes.size();
     if (_received > _services.bounds.packedFile)
       return _services.refusals.answer({413, "too_large", "the file is too large"});
@@ -142,7 +160,7 @@ class FileTaker final : public BodyTaker {
     const Dictionary file{{"uuid", parameter("uuid")},         {"sequence", parameter("sequence")},
                           {"filename", parameter("filename")}, {"description", parameter("description")},
                           {"sha256", _content.hexDigits()},    {"bytes", _gunzip.unpackedBytes()}};
-    Message message{subject::kFiles, "", {{header::kFile, formats::writeJSON(file)}}, {}};
+    Message message{subject::kFiles, "", {{header::kFile, headerText(file)}}, {}};
     identify(message, _wanted, _message.hexDigits());
     _pieces.commit(std::move(message),
                    answeringWith(_services, Answer{200, "{\"success\":true}", "application/json", {}},
@@ -167,6 +185,7 @@ class FileTaker final : public BodyTaker {
   Digest _content;
   Digest _message;
   PieceWriter _pieces;
+  const std::uint64_t _bytes;
   const bool _charged;
   std::uint64_t _received = 0;
 };

@@ -114,6 +114,7 @@ Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& boun
   if (head.method() != "POST") return Failure{Refusal{405, "method", "expected POST"}};
   wanted.place = *place;
   wanted.path = path;
+  wanted.length = head.length();
   wanted.packed = mediaTypeOf(head.field("Content-Encoding")) == "gzip";
   if (auto fault = faultOfFields(head, *place, wanted.packed, bounds)) return Failure{std::move(*fault)};
   if (isPostID(head.field("X-VLT-Post-ID"))) wanted.postID = head.field("X-VLT-Post-ID");

@@ -5,6 +5,7 @@
 #include <atomic>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <variant>
 
@@ -21,9 +22,10 @@ struct BodyBounds {
   std::uint64_t events = 16u << 20;
   std::uint64_t logData = 32u << 20;
   std::uint64_t packedFile = std::uint64_t{2} << 30;
-  std::uint64_t unpackedFile = std::uint64_t{4} << 30;
-  // All that is being received.
+  std::uint64_t unpackedFile = std::uint64_t{2} << 30;
+  // All that is being received, and of files what is in memory, which leaves room for the rest.
   std::uint64_t together = 256u << 20;
+  std::uint64_t files = 128u << 20;
 };
 
 // Bytes that are being received. Any thread.
@@ -44,6 +46,7 @@ struct DoorServices {
   Metrics& metrics;
   Refusals& refusals;
   ByteBudget& budget;
+  ByteBudget& fileBudget;
   BodyBounds bounds;
 };
 
@@ -59,6 +62,8 @@ struct Wanted {
   // Decoded parameters.
   std::map<std::string, std::string> query;
   bool packed = false;
+  // Of the body, where the head says it.
+  std::optional<std::uint64_t> length;
 };
 Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds);
 
@@ -68,13 +73,15 @@ class Door {
   Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed)
       : _refusals(publisher, metrics, shed),
         _budget(bounds.together),
-        _services{publisher, metrics, _refusals, _budget, bounds} {}
+        _fileBudget(bounds.files),
+        _services{publisher, metrics, _refusals, _budget, _fileBudget, bounds} {}
 
   std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
 
  private:
   Refusals _refusals;
   ByteBudget _budget;
+  ByteBudget _fileBudget;
   const DoorServices _services;
 };
 

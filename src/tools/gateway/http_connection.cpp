@@ -150,7 +150,7 @@ void HTTPConnection::answered(const Error& error, bool closes) {
   _taker.reset();
   if (error) return;
   if (!closes) {
-    if (_buffer.size() == 0) _buffer = {};
+    if (_buffer.size() == 0) _buffer = boost::beast::flat_buffer(kMostBuffered);
     return readHead();
   }
   Error ignored;

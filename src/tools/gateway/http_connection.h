@@ -61,7 +61,9 @@ class HTTPConnection : public std::enable_shared_from_this<HTTPConnection> {
 
   Owner& _owner;
   boost::beast::basic_stream<Protocol> _stream;
-  boost::beast::flat_buffer _buffer;
+  // What was read and not yet parsed, which is at most a header, or a piece of a body.
+  static constexpr std::size_t kMostBuffered = 80u << 10;
+  boost::beast::flat_buffer _buffer{kMostBuffered};
   std::optional<Parser> _parser;
   std::unique_ptr<BodyTaker> _taker;
   std::optional<Response> _response;

@@ -65,6 +65,11 @@ bool PieceWriter::hasRoom(std::function<void()> resume) {
   return false;
 }
 
+Outcome PieceWriter::outcome() const {
+  const Lock hold(_shared->mutex);
+  return _shared->outcome;
+}
+
 void PieceWriter::commit(Message last, Publisher::Completion done) {
   if (!_token.empty()) last.headers.emplace_back(header::kPiece, place());
   last.body = std::move(_waiting);

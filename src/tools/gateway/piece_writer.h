@@ -24,6 +24,8 @@ class PieceWriter {
   void add(std::string_view bytes);
   // False: several pieces wait for the stream. `resume` is then called once, when fewer do.
   bool hasRoom(std::function<void()> resume);
+  // The worst of what became of the pieces so far.
+  Outcome outcome() const;
   // `last` has everything but the body. `done` is told what became of the whole; it has the stream's word for
   // every piece before it publishes the last one.
   void commit(Message last, Publisher::Completion done);

@@ -67,8 +67,11 @@ std::optional<Answer> ReceivedBody::add(std::string_view bytes) {
 }
 
 std::optional<Answer> ReceivedBody::end() {
-  if (!_gunzip || _gunzip->state() == Gunzip::State::ended) return std::nullopt;
-  return refusedGzip(_gunzip->state());
+  if (_gunzip && _gunzip->state() != Gunzip::State::ended) return refusedGzip(_gunzip->state());
+  // The body may be held for long.
+  _gunzip.reset();
+  if (_text.capacity() > _text.size() + _text.size() / 4) _text.shrink_to_fit();
+  return std::nullopt;
 }
 
 }  // namespace veltrad::gateway
