@@ -54,7 +54,8 @@ HeldMessages::Bounds heldBounds(const ServeArguments& given) {
 
 BodyBounds bodyBounds(const ServeArguments& given) {
   BodyBounds bounds;
-  bounds.together = given.holdBytes;
+  bounds.eventsTogether = given.holdBytes;
+  bounds.othersTogether = given.holdBytes / 2;
   return bounds;
 }
 
