@@ -1,11 +1,11 @@
 -- SPDX-License-Identifier: Apache-2.0
 -- The events in a column store (ClickHouse), beside PostgreSQL: for questions that read few columns of very many rows. What is
--- written twice is merged, because a row is named by (seq, index): at least once is enough. To carry over what is new, from cron:
+-- written twice is merged, because a row is named by its time and place: at least once is enough. To carry over what is new, from cron:
 --
---   LAST=$(clickhouse-client --query 'SELECT max(seq) FROM veltra.events')
+--   LAST=$(clickhouse-client --query 'SELECT max(received) FROM veltra.events')
 --   psql -qAt -c "COPY (SELECT to_char(received AT TIME ZONE 'UTC', 'YYYY-MM-DD HH24:MI:SS'), seq, index, client_id, coalesce(sender, ''),
 --       coalesce(session_id, ''), coalesce(category, -1), coalesce(type, -1), coalesce(event_number, -1), coalesce(via, ''),
---       fields FROM veltra.events WHERE seq >= $LAST) TO STDOUT (FORMAT csv)" |
+--       fields FROM veltra.events WHERE received >= '$LAST UTC') TO STDOUT (FORMAT csv)" |
 --     clickhouse-client --query 'INSERT INTO veltra.events FORMAT CSV'
 --
 -- An event without a number has -1 there. Count with FINAL, or after OPTIMIZE.

@@ -1,14 +1,17 @@
 -- SPDX-License-Identifier: Apache-2.0
--- The tables that `veltra-gateway drain` fills. It runs this file at each start; every statement may be repeated.
+-- The tables that `veltra-gateway drain` fills. It runs this file at its start, unless the schema's comment says that it has done
+-- so; every statement may be repeated.
 -- "received" is the time at which the stream took a message; "seq" is the message's place in the stream.
 CREATE SCHEMA IF NOT EXISTS veltra;
 
 -- How far each stream has been read: everything up to "seq" is in the tables. "created" tells a stream that was made anew
--- (nanoseconds since 1970).
+-- (nanoseconds since 1970), "time" is that of the message at "seq": a stream that has lost its newest messages gives other ones
+-- their places.
 CREATE TABLE IF NOT EXISTS veltra.position (
   stream text PRIMARY KEY,
   created bigint NOT NULL,
-  seq bigint NOT NULL
+  seq bigint NOT NULL,
+  time bigint NOT NULL DEFAULT 0
 );
 
 -- The IDs that devices gave their posts. A post whose ID stands here is not written again.
@@ -77,7 +80,8 @@ CREATE TABLE IF NOT EXISTS veltra.log_data (
 );
 CREATE INDEX IF NOT EXISTS log_data_location ON veltra.log_data (location);
 
--- What gateways refused as malformed: a sample, at most ten a second of each gateway, cut after 64 KiB.
+-- What gateways refused as malformed: a sample, at most ten a second of each gateway, cut after 64 KiB. The drain keeps it for
+-- seven days.
 CREATE TABLE IF NOT EXISTS veltra.refused (
   received timestamptz NOT NULL,
   seq bigint NOT NULL,
@@ -85,34 +89,48 @@ CREATE TABLE IF NOT EXISTS veltra.refused (
   body bytea NOT NULL
 );
 
--- Events are partitioned by days (UTC). The drain calls this for each day before it writes the first event of it.
+-- Events are partitioned by days (UTC). The drain calls this for each day before it writes the first event of it. A table that is
+-- attached, unlike one that is made as a partition, does not wait for queries of the others.
 CREATE OR REPLACE FUNCTION veltra.partition_for(day date) RETURNS void LANGUAGE plpgsql AS $$
+DECLARE
+  part text := 'events_' || to_char(day, 'YYYYMMDD');
 BEGIN
-  EXECUTE format('CREATE TABLE IF NOT EXISTS veltra.%I PARTITION OF veltra.events FOR VALUES FROM (%L) TO (%L)',
-                 'events_' || to_char(day, 'YYYYMMDD'), day || ' 00:00:00+00', (day + 1) || ' 00:00:00+00');
+  IF to_regclass('veltra.' || part) IS NOT NULL THEN
+    RETURN;
+  END IF;
+  EXECUTE format('CREATE TABLE veltra.%I (LIKE veltra.events INCLUDING ALL)', part);
+  EXECUTE format('ALTER TABLE veltra.events ATTACH PARTITION veltra.%I FOR VALUES FROM (%L) TO (%L)',
+                 part, day || ' 00:00:00+00', (day + 1) || ' 00:00:00+00');
 END $$;
 
--- Retention. Drops whole days of events and deletes the other rows that are older; returns what it dropped. The files of
--- deleted rows stay in their folder, which has a folder for each day.
+-- Retention. Deletes rows that are older and drops whole days of events; returns what it dropped. A day that a query keeps from
+-- being dropped for three seconds stays until the next time. The drain
+-- removes the files of deleted rows with --keep-days alone; there is a folder for each day.
 CREATE OR REPLACE FUNCTION veltra.forget(older_than interval) RETURNS SETOF text LANGUAGE plpgsql AS $$
 DECLARE
   part text;
   name text;
 BEGIN
-  FOR part IN SELECT c.relname FROM pg_inherits i JOIN pg_class c ON c.oid = i.inhrelid
-              WHERE i.inhparent = 'veltra.events'::regclass
-                AND to_date(right(c.relname, 8), 'YYYYMMDD') + 1 <= (now() - older_than) AT TIME ZONE 'UTC' LOOP
-    EXECUTE format('DROP TABLE veltra.%I', part);
-    RETURN NEXT part;
-  END LOOP;
   FOREACH name IN ARRAY ARRAY['datagrams', 'files', 'log_data', 'refused'] LOOP
     EXECUTE format('DELETE FROM veltra.%I WHERE received < $1', name) USING now() - older_than;
   END LOOP;
+  PERFORM set_config('lock_timeout', '3s', true);
+  FOR part IN SELECT c.relname FROM pg_inherits i JOIN pg_class c ON c.oid = i.inhrelid
+              WHERE i.inhparent = 'veltra.events'::regclass
+                AND to_date(right(c.relname, 8), 'YYYYMMDD') + 1 <= (now() - older_than) AT TIME ZONE 'UTC' LOOP
+    BEGIN
+      EXECUTE format('DROP TABLE veltra.%I', part);
+      RETURN NEXT part;
+    EXCEPTION WHEN lock_not_available THEN
+      NULL;
+    END;
+  END LOOP;
 END $$;
 
--- Events of each client type and hour.
+-- Events of each client type and hour (UTC, as in all views). A view reads all days; a question about few of them is answered
+-- sooner by a query of one's own with a condition on "received".
 CREATE OR REPLACE VIEW veltra.events_by_hour AS
-SELECT date_trunc('hour', received) AS hour, sender, count(*) AS events,
+SELECT date_trunc('hour', received, 'UTC') AS hour, sender, count(*) AS events,
        count(DISTINCT session_id) AS sessions, count(DISTINCT client_id) AS clients
 FROM veltra.events
 GROUP BY 1, 2;
@@ -131,36 +149,47 @@ WHERE session_id IS NOT NULL
 GROUP BY session_id, session_path;
 
 -- The share of sessions that report, as their stop messages tell it: a session reports if a number drawn from 0 to 1 is
--- at most its threshold. "expected" is how many sessions there were for those that reported; null where a
--- threshold is missing.
+-- at most its threshold; a negative threshold is none, and all report. Each session that reports stands for 1/threshold sessions:
+-- "expected" is how many there were, for those whose stop message has the threshold.
 CREATE OR REPLACE VIEW veltra.sampled AS
-SELECT date_trunc('day', received) AS day, sender, via,
+SELECT date_trunc('day', received, 'UTC') AS day, sender, via,
        count(*) AS sessions,
-       avg(least(threshold, 1)) AS share,
-       sum(1 / nullif(least(threshold, 1), 0)) AS expected
+       count(threshold) / sum(1 / threshold) AS share,
+       sum(1 / threshold) AS expected
 FROM (SELECT received, sender, via,
-             CASE WHEN jsonb_typeof(fields->'SamplingThreshold') = 'number'
-                       AND (fields->>'SamplingThreshold')::numeric >= 0
-                  THEN (fields->>'SamplingThreshold')::numeric END AS threshold
+             CASE WHEN jsonb_typeof(fields->'SamplingThreshold') = 'number' THEN
+               CASE WHEN (fields->>'SamplingThreshold')::numeric < 0 THEN 1
+                    ELSE nullif(least((fields->>'SamplingThreshold')::numeric, 1), 0) END
+             END AS threshold
       FROM veltra.events WHERE category = 0 AND type = 1) AS stops
 GROUP BY 1, 2, 3;
 
--- Loss as the fleet sees it: a session's back end numbers its events from 1, so numbers that are missing below the highest
--- one did not arrive, or not yet. Numbers start again after 65,535.
+-- Loss as the fleet sees it: a session's back end numbers its messages from 1, so numbers that are missing below the highest
+-- one did not arrive, or not yet, or were not to be reported. Each label ("via") is counted apart; where a session went on under
+-- another label, as after a new storebag, its numbers go on, too. Two back ends without labels of their own hide each other's loss,
+-- and so does a session of more than 65,535 messages its own.
 CREATE OR REPLACE VIEW veltra.gaps AS
-SELECT session_id, via, min(client_id) AS client_id, min(sender) AS sender,
-       max(event_number) AS highest, count(DISTINCT event_number) AS arrived,
-       max(event_number) - count(DISTINCT event_number) AS missing
-FROM veltra.events
-WHERE session_id IS NOT NULL AND event_number >= 1
-GROUP BY session_id, via
-HAVING max(event_number) > count(DISTINCT event_number);
+SELECT session_id, via, client_id, sender, highest, arrived, highest - before - arrived AS missing
+FROM (SELECT numbers.*,
+             coalesce((SELECT max(event_number) FROM veltra.events e
+                       WHERE e.session_id = numbers.session_id AND e.client_id = numbers.client_id
+                         AND e.via IS DISTINCT FROM numbers.via AND e.event_number BETWEEN 1 AND numbers.lowest - 1
+                         AND NOT EXISTS (SELECT FROM veltra.events o
+                                         WHERE o.session_id = e.session_id AND o.client_id = e.client_id
+                                           AND o.via IS NOT DISTINCT FROM e.via AND o.event_number >= numbers.lowest)), 0) AS before
+      FROM (SELECT session_id, via, client_id, min(sender) AS sender, min(event_number) AS lowest,
+                   max(event_number) AS highest, count(DISTINCT event_number) AS arrived
+            FROM veltra.events
+            WHERE session_id IS NOT NULL AND event_number >= 1
+            GROUP BY session_id, via, client_id
+            HAVING max(event_number) > count(DISTINCT event_number)) AS numbers) AS counted
+WHERE highest - before > arrived;
 
 -- Which storebags are in use and how a rollout spreads. An event does not say which storebag it comes from; an operator
 -- writes a label into the "post_url" of each version ("https://…/events/v42"), which is "via". "library" is the version of the
 -- client library.
 CREATE OR REPLACE VIEW veltra.storebag_versions AS
-SELECT date_trunc('hour', received) AS hour, via, fields->>'_reportVers' AS library, sender,
+SELECT date_trunc('hour', received, 'UTC') AS hour, via, fields->>'_reportVers' AS library, sender,
        count(DISTINCT client_id) AS clients, count(DISTINCT session_id) AS sessions, count(*) AS events
 FROM veltra.events
 GROUP BY 1, 2, 3, 4;

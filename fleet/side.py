@@ -98,8 +98,12 @@ class Fleet:
                  "streams": {name: ports[3 * at:3 * at + 3] for at, name in enumerate(STREAMS)},
                  "gateways": {name: ports[9 + 2 * at:11 + 2 * at] for at, name in enumerate(GATEWAYS)}}
         fleet = cls(path, facts)
-        fleet.configure()
-        fleet.save()
+        try:
+            fleet.configure()
+            fleet.save()
+        except BaseException:
+            fleet.remove()
+            raise
         return fleet
 
     @classmethod
@@ -278,7 +282,10 @@ class Fleet:
 
     def table(self, sql):
         """The same as psql shows it."""
-        return subprocess.run([program("psql"), "-qX", "-c", sql, self.dsn], capture_output=True, text=True).stdout
+        done = subprocess.run([program("psql"), "-qX", "-c", sql, self.dsn], capture_output=True, text=True)
+        if done.returncode != 0:
+            raise AssertionError(done.stderr)
+        return done.stdout
 
     def is_carried(self):
         """Whether the tables hold everything that the stream has taken."""

@@ -10,6 +10,7 @@ import re
 import signal
 import socket
 import subprocess
+import tempfile
 import time
 import unittest
 import urllib.parse
@@ -52,7 +53,9 @@ class Doors(FleetTest):
                     self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
                     if where == "direct":
                         self.assertTrue(answer.headers["X-VLT-Refused"])
-            self.assertIn(door.request("GET", "/events").status, (403, 405))
+            for path in ("/events", "/upload", "/logdata"):
+                answer = door.request("GET", path)
+                self.assertEqual((answer.status, answer.body, answer.headers["Allow"]), (405, b"", "POST"))
             door.close()
             large = door.request("POST", "/events", good, {**JSON, "X-Large": "x" * 65536})
             self.assertIn(large.status, (400, 431))
@@ -123,6 +126,28 @@ class Doors(FleetTest):
         [[found]] = self.rows(f"SELECT items FROM veltra.log_data WHERE location = '{answer.body.decode()}'", 1)
         self.assertEqual(json.loads(found), ["a line", {"level": 3, "nul": "�"}, ["x" * 2_000_000]])
 
+    def test_views_answer_what_has_come(self):
+        def event(session, number, kind=10, **more):
+            return {"_sender": "ZZ", "_sessionID": session, "_eventNumber": number, "_method": 0 if kind < 10 else 5, "_status": kind, **more}
+        labels = {"a": [event("G", 1), event("G", 2), event("G", 4), event("H", 1), event("H", 2), event("R", 1), event("R", 2)],
+                  "b": [event("G", 6), event("G", 7), event("R", 3), event("R.S", 1, 0)],
+                  "stops": [event(f"S{at}", 1, 1, SamplingThreshold=share) for at, share in enumerate([1, 0.1, 0.1, -1, 2, "none"])]}
+        for label, events in labels.items():
+            self.assertEqual(self.through().post(f"/events/{label}", envelope(*events, client="views")).status, 200)
+        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'views'", 17)
+        for view, columns, rows in (
+                ("gaps", "session_id, via, highest, arrived, missing", ["G a 4 3 1", "G b 7 2 1"]),
+                ("sampled", "via, sessions, round(share, 4), round(expected)", [f"stops 6 {5 / 23:.4f} 23"]),
+                ("sessions", "session_id, tree, parent, depth, events, started, stopped",
+                 ["G G  0 5 f f", "H H  0 2 f f", "R R  0 3 f f", "R.S R R 1 1 t f", *(f"S{at} S{at}  0 1 f t" for at in range(6))]),
+                ("events_by_hour", "sum(events), max(clients)", ["17 1"]),
+                ("storebag_versions", "via, sum(sessions), sum(events)", ["a 3 7", "b 3 4", "stops 6 6"])):
+            with self.subTest(view=view):
+                grouped = "GROUP BY via" if view == "storebag_versions" else ""
+                found = self.fleet.query(f"SELECT {columns} FROM veltra.{view} WHERE sender = 'ZZ' {grouped} ORDER BY 1"
+                                         + (", 2" if view == "gaps" else ""))
+                self.assertEqual([" ".join(row) for row in found], rows)
+
     def test_datagrams(self):
         dashboard = Dashboard(self.line["dashboard"])
         for packet in (datagram(1)[:63], datagram(1, kind=2), datagram(1, length=70), datagram(1, b"x" * 1024), b""):
@@ -136,6 +161,8 @@ class Doors(FleetTest):
         self.assertEqual(row[:7], ["d" * 40, "FU", "77", "3", "5", "10", "3"])
         self.assertEqual(json.loads(row[7]), {"a": "1", "b": "x=y z", "c": "�"})
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
+        self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
+        self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
 
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
@@ -147,23 +174,44 @@ class Doors(FleetTest):
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 304)
         self.fleet.publish("quindle", bag.replace('"1"', '"2"'))
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 200)
-        missing = door.request("GET", "/bags/maple/nothing")
-        self.assertEqual((missing.status, missing.body), (404, b""))
+        for path in ("nothing", "", ".before/quindle/1", "quindle/x"):
+            missing = door.request("GET", "/bags/maple/" + path)
+            self.assertEqual((missing.status, missing.body), (404, b""), path)
 
 
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
 
-    def gateway(self, *arguments, hold="0.5"):
-        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", "127.0.0.1:0",
+    def test_listens_on_a_socket_that_others_may_use(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder) / "gateway.sock"
+            with socket.socket(socket.AF_UNIX) as left:
+                left.bind(str(path))  # as a gateway that was killed leaves it
+            process, _, _ = self.gateway(listen=f"unix:{path}")
+            self.assertEqual(path.stat().st_mode & 0o777, 0o666)
+            with socket.socket(socket.AF_UNIX) as link:
+                link.connect(str(path))
+                link.sendall(b"GET /events HTTP/1.1\r\nHost: h\r\n\r\n")
+                self.assertTrue(link.recv(1000).startswith(b"HTTP/1.1 405"))
+            process.terminate()
+            self.assertEqual(process.wait(15), 0)
+            self.assertFalse(path.exists())
+            path.write_text("not a socket")
+            refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
+                                     capture_output=True, text=True)
+            self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
+
+    def gateway(self, *arguments, hold="0.5", listen="127.0.0.1:0"):
+        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", listen,
                                     "--admin", "127.0.0.1:0", "--hold", hold, *arguments], stdout=subprocess.PIPE,
                                    stderr=subprocess.DEVNULL, text=True)
         self.addCleanup(process.stdout.close)
         self.addCleanup(process.wait)
         self.addCleanup(process.kill)
         line = json.loads(process.stdout.readline())
-        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1])))
-        self.addCleanup(door.close)
+        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1]))) if line["listen"].startswith("http") else None
+        if door:
+            self.addCleanup(door.close)
         return process, door, line
 
     def test_what_is_held_too_long_is_to_come_again(self):

@@ -75,7 +75,7 @@ Message messageOfDatagram(std::string_view datagram) {
   const Dictionary packet = tools::fieldsOfPacket(datagram);
   const auto number = [&packet](const char* key) { return packet.uint32(key).value_or(0); };
   const char* sender = config::senderCodeForComponentType(static_cast<std::int32_t>(number("componentType")));
-  const Dictionary fields{
+  Dictionary fields{
       {"deviceID", *packet.find("deviceID")},
       {"sender", sender ? sender : std::to_string(number("componentType"))},
       {"sessionID", number("sessionID")},
@@ -85,8 +85,10 @@ Message messageOfDatagram(std::string_view datagram) {
       {"eventNumber", number("eventID")},
       {"time", number("seconds") + number("timeFraction") * 4 / 1000.0},
       {"text", *packet.find("text")},
-      {"fields", *packet.find("payload")},
   };
+  const Dictionary& items = *packet.dictionary("payload");
+  // Such an object stands for a date or data, which datagrams do not have.
+  if (items.size() != 1 || !(items.contains("$date") || items.contains("$data"))) fields.set("fields", items);
   return {subject::kDatagrams, digestOf("/dashboard", datagram), {}, formats::writeJSON(fields)};
 }
 

@@ -80,6 +80,8 @@ class HTTPServer {
   // Any thread.
   void end();
   std::size_t connections() const;
+  // Whether the thread that serves does something else within this time.
+  bool answersWithin(std::chrono::seconds time);
 
  private:
   struct Library;

@@ -4,6 +4,7 @@
 
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/time.h>
 
@@ -12,7 +13,9 @@
 #include <cstring>
 #include <ctime>
 #include <filesystem>
+#include <set>
 
+#include "base/file_descriptor.h"
 #include "config/storebag_container.h"
 #include "platform/file_store.h"
 #include "storebag/lint.h"
@@ -82,9 +85,12 @@ Result<Publication, std::string> checked(const std::string& file, const PublishR
     return Failure{
         fmt::format("{}: the storebag's name is \"{}\", the file's is \"{}\"", file, *name, made.name)};
   const std::string path = request.directory + "/" + made.name;
-  if (!fs::exists(path)) return made;
+  std::error_code error;
+  if (!fs::exists(path, error) && !error) return made;
+  // One that cannot be read now may have a higher serial.
   const auto served = readStorebag(path);
-  const auto before = served ? serialOf(served.value().storebag) : std::nullopt;
+  if (!served) return Failure{served.error().line()};
+  const auto before = serialOf(served.value().storebag);
   if (const std::string fault = faultOfSerial(before, serialOf(bag.value().storebag)); !fault.empty())
     return Failure{file + ": " + fault};
   return made;
@@ -97,6 +103,8 @@ std::optional<std::string> put(const Publication& made, const std::string& direc
   const fs::path kept = folderBefore(directory, made.name);
   const std::time_t before = modified(path);
   if (const auto served = files.read(path, config::kStorebagMostContainerBytes); served) {
+    // What is published again would take the place of what a rollback is for.
+    if (served.value() == made.bytes) return std::nullopt;
     const auto numbers = keptNumbers(kept);
     if (auto folder = platform::makeDirectories(kept.string()); !folder) return folder.error().description;
     const std::string next = (kept / std::to_string(numbers.empty() ? 1 : numbers.back() + 1)).string();
@@ -110,6 +118,14 @@ std::optional<std::string> put(const Publication& made, const std::string& direc
   return makeNewer(path, before);
 }
 
+// Whoever publishes meanwhile waits; until the descriptor is closed.
+Result<FileDescriptor, std::string> lockOf(const std::string& directory) {
+  FileDescriptor folder(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!folder.isOpen() || ::flock(folder.get(), LOCK_EX) != 0)
+    return Failure{directory + ": " + std::strerror(errno)};
+  return Result<FileDescriptor, std::string>(std::move(folder));
+}
+
 }  // namespace
 
 std::string faultOfSerial(std::optional<std::int64_t> served, std::optional<std::int64_t> next) {
@@ -120,14 +136,16 @@ std::string faultOfSerial(std::optional<std::int64_t> served, std::optional<std:
 }
 
 Outcome publish(const PublishRequest& request) {
+  if (auto made = platform::makeDirectories(request.directory); !made)
+    return {false, made.error().description};
+  const auto lock = lockOf(request.directory);
+  if (!lock) return {false, lock.error()};
   std::vector<Publication> all;
   for (const std::string& file : request.files) {
     auto one = checked(file, request);
     if (!one) return {false, one.error()};
     all.push_back(std::move(one).value());
   }
-  if (auto made = platform::makeDirectories(request.directory); !made)
-    return {false, made.error().description};
   std::string text;
   for (const Publication& one : all) {
     if (const auto failure = put(one, request.directory)) return {false, *failure};
@@ -138,7 +156,13 @@ Outcome publish(const PublishRequest& request) {
 
 Outcome rollback(const std::vector<std::string>& names, const std::string& directory) {
   platform::DiskFileStore files;
+  const auto lock = lockOf(directory);
+  if (!lock) return {false, lock.error()};
+  std::set<std::string> once;
   for (const std::string& name : names) {
+    if (name.empty() || name.starts_with('.') || name.find('/') != std::string::npos)
+      return {false, fmt::format("{}: expected the name of a storebag", name)};
+    if (!once.insert(name).second) return {false, fmt::format("{}: the name is given twice", name)};
     if (keptNumbers(folderBefore(directory, name)).empty())
       return {false, fmt::format("{}: nothing was published before {}", directory, name)};
   }

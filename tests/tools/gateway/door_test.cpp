@@ -6,6 +6,7 @@
 #include "formats/json.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
+#include "gateway/table_rows.h"
 #include "support/gzip.h"
 
 namespace veltrad::gateway {
@@ -187,6 +188,19 @@ TEST(Datagrams, BecomeTheSameMessageWheneverTheyAreSent) {
   EXPECT_EQ(fields.uint32("eventNumber"), 7u);
   EXPECT_EQ(fields.real("time"), 1400000000.12);
   EXPECT_EQ(*fields.dictionary("fields"), (Dictionary{{"a", "1"}, {"b", "x=y"}, {"c", "z z"}, {"d", ""}}));
+}
+
+TEST(Datagrams, StandInTheTableWhateverTheirItemsAreCalled) {
+  std::string header("\x02\x06\x01\x1e\x53\x72\x4e\x00\xff\xff\xed\xcb\xff\xfc\xff\xab\x00\x05\x00\x0a", 20);
+  header += std::string(40, 'd') + std::string("\x00\x07\x00\x01", 4);
+  for (const char* item : {"$date=5", "$data=YQ==", "$date=", "a=1"}) {
+    Taken message;
+    message.body = messageOfDatagram(header + " " + item).body;
+    TableRows rows;
+    ASSERT_TRUE(rows.addDatagram(message).ok()) << item;
+    const std::string_view key(item, std::string_view(item).find('='));
+    EXPECT_THAT(rows.datagrams, testing::HasSubstr("{\"" + std::string(key) + "\":\"")) << item;
+  }
 }
 
 }  // namespace

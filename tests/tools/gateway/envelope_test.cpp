@@ -45,6 +45,13 @@ TEST(Envelope, IsRefusedForWhatNoTableTakes) {
   }
 }
 
+TEST(Envelope, HasABoundOfEvents) {
+  std::string events = "{}";
+  for (std::size_t i = 1; i < kMostEvents; ++i) events += ",{}";
+  EXPECT_EQ(parseEnvelope(withEvent(events)).value().events.size(), kMostEvents);
+  EXPECT_THAT(parseEnvelope(withEvent(events + ",{}")).error(), HasSubstr("65537 events"));
+}
+
 TEST(Envelope, KeepsCharactersThatADatabaseTakes) {
   const std::pair<const char*, std::string> rows[] = {
       {R"(\u0000)", "\xef\xbf\xbd"},

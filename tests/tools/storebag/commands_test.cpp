@@ -118,6 +118,7 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
   EXPECT_GE(time(), firstTime + std::chrono::seconds(1)) << "a daemon that has the first would get 304";
   const std::string second = read("served/quindle");
   EXPECT_NE(first, second);
+  ASSERT_TRUE(publish(path("quindle")).done) << "the same again";
 
   std::filesystem::create_directories(path("broken"));
   std::string broken = second;
@@ -129,6 +130,9 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
               HasSubstr("ostvane"));
   EXPECT_EQ(read("served/quindle"), second);
 
+  EXPECT_THAT(refusal(storebag::rollback({"quindle", "quindle"}, path("served"))), HasSubstr("twice"));
+  EXPECT_THAT(refusal(storebag::rollback({"../quindle"}, path("served"))),
+              HasSubstr("the name of a storebag"));
   const auto secondTime = time();
   ASSERT_TRUE(storebag::rollback({"quindle"}, path("served")).done);
   EXPECT_EQ(read("served/quindle"), first);
