@@ -76,6 +76,14 @@ def alive(pid):
         return False
 
 
+def end_session(pid):
+    """Ends what a part that was killed has left: nginx's workers go on without their master."""
+    for path in glob.glob("/proc/[0-9]*/stat"):
+        with contextlib.suppress(OSError):
+            if int(pathlib.Path(path).read_text().rsplit(")", 1)[1].split()[3]) == pid:
+                os.kill(int(path.split("/")[2]), signal.SIGKILL)
+
+
 def filled(name, values):
     """The text of a configuration, with @NAME@ replaced."""
     return re.sub(r"@([A-Z_]+)@", lambda found: str(values[found[1]]), (HERE / name).read_text())
@@ -218,6 +226,8 @@ class Fleet:
         return [program("veltrad")]
 
     def begin(self, name):
+        if name in self.facts["pids"]:
+            end_session(self.facts["pids"][name])
         environment = {key: value for key, value in os.environ.items() if not key.startswith("VELTRA_") and key != "NOTIFY_SOCKET"}
         if name == "daemon":
             environment.update(VELTRA_ROOT=str(self.path / "root"), VELTRA_LOG_TARGET="stderr", LANG="en_US.UTF-8")
@@ -306,6 +316,8 @@ class Fleet:
         self.facts = Fleet.at(self.path).facts
         for name in reversed(START_ORDER):
             pid = self.facts["pids"].get(name)
+            if pid and not alive(pid):
+                end_session(pid)
             if not pid or not alive(pid):
                 continue
             self.kill(name, signal.SIGINT if name == "postgres" else signal.SIGTERM)

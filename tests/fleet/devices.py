@@ -131,7 +131,7 @@ def post_id():
 
 
 def packed(bytes_):
-    return gzip.compress(bytes_)
+    return gzip.compress(bytes_, 1)
 
 
 def together(works):

@@ -12,7 +12,7 @@ from devices import Dashboard, FleetTest, datagram, envelope, post_id, together
 
 ROUNDS = int(os.environ.get("VELTRA_ROUNDS", "6"))
 CLIENTS = int(os.environ.get("VELTRA_CLIENTS", "12"))
-VICTIMS = ["stream1", "gateway1", "drain", "postgres", "stream2", "gateway2", "stream3"]
+VICTIMS = ["stream1", "nginx", "gateway1", "drain", "postgres", "stream2", "gateway2", "stream3"]
 
 
 class Device:
