@@ -12,14 +12,6 @@ namespace {
 using enum KeyType;
 using enum Need;
 
-// A key without effect in this version.
-constexpr Key later(const char* name, KeyType type, Range range, const char* byDefault, const char* meaning,
-                    const char* choices = nullptr) {
-  Key key{name, type, range, optional, byDefault, meaning};
-  key.choices = choices;
-  return key;
-}
-
 template <auto Member>
 constexpr Key chosen(const char* name, const char* choices, const char* byDefault, const char* meaning) {
   Key key = row<Member>({name, choice, kUnbounded, optional, byDefault, meaning}).key;
@@ -119,7 +111,17 @@ constexpr std::array kSettingsKeys{
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
                                         "How event posts are compressed.", &CompressionChoices::kKeys})
         .key,
-    later("jitter", real, {0, 1}, "0", "Share by which refresh cycles and waits are spread, per device."),
+    row<&OperatorChoices::jitter>(
+        {"jitter",
+         real,
+         {0, 1},
+         optional,
+         "0",
+         "Share by which the times between fetches of a storebag are spread, so that devices do not ask at "
+         "once: up to that share of its refresh cycle sooner, or of it later than 900 seconds after a "
+         "failure. "
+         "Each device draws anew for each fetch."})
+        .key,
 };
 
 }  // namespace

@@ -65,8 +65,7 @@ void take(const Key& key, const Value& value, std::optional<SpoolChoices>& field
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
 
-// What holds without the file stands here; the table has keys of later versions too, which are checked and
-// have no effect.
+// What holds without the file stands here.
 struct OperatorChoices {
   Sampling sampling = Sampling::drawn;
   StorebagChoices storebags;
@@ -75,6 +74,7 @@ struct OperatorChoices {
   CompressionChoices compression;
   // Nothing: posts that fail are not kept.
   std::optional<SpoolChoices> spool;
+  std::optional<double> jitter = 0;  // a share
 
   static const KeyTable kKeys;
 };

@@ -126,28 +126,6 @@ class Doors(FleetTest):
         [[found]] = self.rows(f"SELECT items FROM veltra.log_data WHERE location = '{answer.body.decode()}'", 1)
         self.assertEqual(json.loads(found), ["a line", {"level": 3, "nul": "�"}, ["x" * 2_000_000]])
 
-    def test_views_answer_what_has_come(self):
-        def event(session, number, kind=10, **more):
-            return {"_sender": "ZZ", "_sessionID": session, "_eventNumber": number, "_method": 0 if kind < 10 else 5, "_status": kind, **more}
-        labels = {"a": [event("G", 1), event("G", 2), event("G", 4), event("H", 1), event("H", 2), event("R", 1), event("R", 2)],
-                  "b": [event("G", 6), event("G", 7), event("R", 3), event("R.S", 1, 0)],
-                  "stops": [event(f"S{at}", 1, 1, SamplingThreshold=share) for at, share in enumerate([1, 0.1, 0.1, -1, 2, "none"])]}
-        for label, events in labels.items():
-            self.assertEqual(self.through().post(f"/events/{label}", envelope(*events, client="views")).status, 200)
-        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'views'", 17)
-        for view, columns, rows in (
-                ("gaps", "session_id, via, highest, arrived, missing", ["G a 4 3 1", "G b 7 2 1"]),
-                ("sampled", "via, sessions, round(share, 4), round(expected)", [f"stops 6 {5 / 23:.4f} 23"]),
-                ("sessions", "session_id, tree, parent, depth, events, started, stopped",
-                 ["G G  0 5 f f", "H H  0 2 f f", "R R  0 3 f f", "R.S R R 1 1 t f", *(f"S{at} S{at}  0 1 f t" for at in range(6))]),
-                ("events_by_hour", "sum(events), max(clients)", ["17 1"]),
-                ("storebag_versions", "via, sum(sessions), sum(events)", ["a 3 7", "b 3 4", "stops 6 6"])):
-            with self.subTest(view=view):
-                grouped = "GROUP BY via" if view == "storebag_versions" else ""
-                found = self.fleet.query(f"SELECT {columns} FROM veltra.{view} WHERE sender = 'ZZ' {grouped} ORDER BY 1"
-                                         + (", 2" if view == "gaps" else ""))
-                self.assertEqual([" ".join(row) for row in found], rows)
-
     def test_datagrams(self):
         dashboard = Dashboard(self.line["dashboard"])
         for packet in (datagram(1)[:63], datagram(1, kind=2), datagram(1, length=70), datagram(1, b"x" * 1024), b""):
@@ -163,6 +141,16 @@ class Doors(FleetTest):
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
         self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
         self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
+
+    def test_storebags_go_back(self):
+        door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
+        self.fleet.publish("ostvane", bags[0])
+        first = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.publish("ostvane", bags[1])
+        second = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.storebag("rollback", "ostvane", "bags")
+        back = door.request("GET", "/bags/maple/ostvane", headers={"If-Modified-Since": second.headers["Last-Modified"]})
+        self.assertEqual((back.status, back.body), (200, first.body))
 
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
