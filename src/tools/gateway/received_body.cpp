@@ -83,7 +83,9 @@ std::string ReceivedBody::take() {
 
 bool ReceivedBody::becomes(const Message& message) {
   _gunzip.reset();
-  _text = {};
+  // An assignment of an empty text would leave it its memory.
+  _text.clear();
+  _text.shrink_to_fit();
   return _charge.to(message.bytes());
 }
 

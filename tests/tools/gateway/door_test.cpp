@@ -6,6 +6,7 @@
 #include "formats/json.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
+#include "gateway/received_body.h"
 #include "gateway/table_rows.h"
 #include "support/gzip.h"
 
@@ -94,19 +95,23 @@ class Room : public testing::Test {
   static constexpr std::size_t kHeldBytes = 2u << 20;
 
   Room()
-      : publisher(
-            Publisher::open({.servers = {"nats://127.0.0.1:1"}}, {.bytes = kHeldBytes}, metrics).value()),
+      : publisher(Publisher::open(unreachable(), {.bytes = kHeldBytes}, metrics).value()),
         door(*publisher, metrics,
              {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429) {}
   // No completion comes after what it uses.
   ~Room() override { publisher.reset(); }
 
+  static StreamOptions unreachable() {
+    StreamOptions options;
+    options.servers = {"nats://127.0.0.1:1"};
+    return options;
+  }
   // The taker, or nothing: refused with 429.
   std::unique_ptr<BodyTaker> open(const FakeHead& head) {
     auto handled = door.request(head);
-    if (const auto* refusal = std::get_if<Answer>(&handled)) EXPECT_EQ(refusal->status, 429);
-    auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled);
-    return taker ? std::move(*taker) : nullptr;
+    if (auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled)) return std::move(*taker);
+    EXPECT_EQ(std::get<Answer>(handled).status, 429);
+    return nullptr;
   }
   // The status of the refusal; 0: the whole is held.
   static int post(BodyTaker& taker, std::string_view body) {
@@ -144,6 +149,21 @@ TEST_F(Room, IsTakenByWhatABodyKeeps) {
   const auto packed = open(head("/events", {{"Content-Encoding", "gzip"}}));
   EXPECT_FALSE(packed) << "the first is held still, and zlib needs more than is left";
   EXPECT_EQ(publisher->held(), 1u);
+}
+
+TEST_F(Room, IsGivenBackByABodyThatBecomesAMessage) {
+  Refusals refusals(*publisher, metrics, 429);
+  const DoorServices services{*publisher, metrics, refusals, {}};
+  ByteBudget budget(1'000'000);
+  ReceivedBody body(services, Charge(budget), false, 900'000);
+  const std::string text(900'000, 'x');
+  std::string_view bytes = text;
+  EXPECT_FALSE(body.add(bytes));
+  Charge other(budget);
+  EXPECT_FALSE(other.to(200'000));
+  EXPECT_TRUE(body.becomes(Message()));
+  EXPECT_TRUE(other.to(200'000));
+  EXPECT_LT(body.text().capacity(), 100u);
 }
 
 TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
