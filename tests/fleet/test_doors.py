@@ -6,6 +6,7 @@ import json
 import os
 import pathlib
 import plistlib
+import re
 import socket
 import subprocess
 import tempfile
@@ -163,6 +164,17 @@ class Doors(FleetTest):
         for path in ("nothing", "", ".before/quindle/1", "quindle/x"):
             missing = door.request("GET", "/bags/maple/" + path)
             self.assertEqual((missing.status, missing.body), (404, b""), path)
+
+
+    def test_connections_between_requests_keep_little(self):
+        def resident():
+            status = pathlib.Path(f"/proc/{self.fleet.facts['pids']['gateway1']}/status").read_text()
+            return int(re.search(r"^VmRSS:\s+(\d+)", status, re.M)[1])
+        body = envelope({}, client="many")
+        self.assertEqual(self.direct().post("/events", body).status, 200)
+        before, doors = resident(), [self.direct() for _ in range(600)]
+        self.assertEqual({door.post("/events", body).status for door in doors}, {200})
+        self.assertLess((resident() - before) / len(doors), 9, "KiB")
 
 
 class Alone(unittest.TestCase):

@@ -67,7 +67,7 @@ class HTTPConnection : public std::enable_shared_from_this<HTTPConnection> {
   std::optional<Parser> _parser;
   std::unique_ptr<BodyTaker> _taker;
   std::optional<Response> _response;
-  // For the body's bytes; none between requests.
+  // For the body's bytes; without memory between requests.
   std::string _room;
   std::size_t _lingered = 0;
   bool _idle = false;

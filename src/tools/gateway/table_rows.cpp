@@ -121,8 +121,8 @@ std::size_t TableRows::bytes() const {
 }
 
 void TableRows::clear() {
-  // The memory goes, too.
-  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts}) *rows = {};
+  // The memory goes, too, which "= {}" would keep.
+  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts}) *rows = std::string();
 }
 
 Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string body) {
