@@ -166,17 +166,6 @@ class Doors(FleetTest):
             self.assertEqual((missing.status, missing.body), (404, b""), path)
 
 
-    def test_connections_between_requests_keep_little(self):
-        def resident():
-            status = pathlib.Path(f"/proc/{self.fleet.facts['pids']['gateway1']}/status").read_text()
-            return int(re.search(r"^VmRSS:\s+(\d+)", status, re.M)[1])
-        body = envelope({}, client="many")
-        self.assertEqual(self.direct().post("/events", body).status, 200)
-        before, doors = resident(), [self.direct() for _ in range(600)]
-        self.assertEqual({door.post("/events", body).status for door in doors}, {200})
-        self.assertLess((resident() - before) / len(doors), 9, "KiB")
-
-
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
 
@@ -198,6 +187,18 @@ class Alone(unittest.TestCase):
             refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
                                      capture_output=True, text=True)
             self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
+
+    def test_connections_between_requests_keep_little(self):
+        process, first, _ = self.gateway()
+
+        def resident():
+            return int(re.search(r"^VmRSS:\s+(\d+)", pathlib.Path(f"/proc/{process.pid}/status").read_text(), re.M)[1])
+        self.assertEqual(first.post("/events", b"{}").status, 400)
+        before, doors = resident(), [Door(first.address) for _ in range(600)]
+        for door in doors:
+            self.addCleanup(door.close)
+        self.assertEqual({door.post("/events", b"{}").status for door in doors}, {400})
+        self.assertLess((resident() - before) / len(doors), 9, "KiB; the room for a body is 16")
 
     def gateway(self, *arguments, hold="0.5", listen="127.0.0.1:0"):
         process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", listen,

@@ -118,7 +118,7 @@ void HTTPConnection::bodyRead(const Error& error, std::size_t) {
 }
 
 void HTTPConnection::finish() {
-  _room = std::string();
+  std::string().swap(_room);
   _stream.expires_never();
   _taker->finish([self = shared_from_this()](Answer made) {
     boost::asio::post(self->_stream.get_executor(),
@@ -127,7 +127,7 @@ void HTTPConnection::finish() {
 }
 
 void HTTPConnection::answer(Answer made, bool closes) {
-  _room = std::string();
+  std::string().swap(_room);
   closes = closes || _owner.stopping || !_parser->get().keep_alive();
   _response.emplace();
   _response->version(11);
