@@ -5,16 +5,10 @@ import math
 
 from figures import number
 from latency import QUANTILES
+from svg import STYLE, text
 
 WIDTH, LEFT, RIGHT, TOP, PANEL, GROUP, BAR = 460, 58, 62, 74, 132, 34, 13
 COLOURS = {"send with reply": "#2f6fbf", "bare socket": "#8a8f98"}
-STYLE = """text { font: 14px system-ui, sans-serif; fill: #222 } .title { font-size: 16px; font-weight: 600 }
-.small { font-size: 12px } .grid { stroke: #d8dbe0 } .back { fill: #fff }
-@media (prefers-color-scheme: dark) { text { fill: #e6e6e6 } .grid { stroke: #3a3f47 } .back { fill: #16191d } }"""
-
-
-def text(x, y, words, kind="", anchor="start"):
-    return f'<text class="{kind}" x="{x:.1f}" y="{y:.1f}" text-anchor="{anchor}">{words}</text>'
 
 
 def drawing(medians):

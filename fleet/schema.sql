@@ -127,69 +127,90 @@ BEGIN
   END LOOP;
 END $$;
 
--- Events of each client type and hour (UTC, as in all views). A view reads all days; a question about few of them is answered
--- sooner by a query of one's own with a condition on "received".
+-- The views. Hours and days are those of UTC, whatever time zone a session of the database has. A condition on them reads all
+-- that is kept: for a part of it, ask the tables with a condition on "received". A null stands for what an event does not say.
+
+-- Events of each client type and hour. Sessions and clients of an hour count once in it.
 CREATE OR REPLACE VIEW veltra.events_by_hour AS
 SELECT date_trunc('hour', received, 'UTC') AS hour, sender, count(*) AS events,
-       count(DISTINCT session_id) AS sessions, count(DISTINCT client_id) AS clients
+       count(DISTINCT client_id || '/' || session_id) AS sessions, count(DISTINCT client_id) AS clients
 FROM veltra.events
 GROUP BY 1, 2;
 
--- Sessions as trees: "path" leads from the root's session to this one, "parent" is the identifier that the one above
--- reports under, and "tree" is the same for all sessions of one family.
+-- Sessions as trees: one row for each session, or for each client of it if the client's identifier has changed. "path" leads
+-- from the root's session to this one, "parent" is the identifier that the one above reports under, null for a root, and
+-- "tree" is the same for all sessions of one family.
 CREATE OR REPLACE VIEW veltra.sessions AS
 SELECT session_id, session_path[1] AS tree,
        nullif(array_to_string(session_path[1:cardinality(session_path) - 1], '.'), '') AS parent,
        cardinality(session_path) - 1 AS depth, session_path AS path,
-       min(client_id) AS client_id, min(sender) AS sender,
+       client_id, min(sender) AS sender,
        count(*) AS events, min(received) AS first_received, max(received) AS last_received,
-       bool_or(category = 0 AND type = 0) AS started, bool_or(category = 0 AND type = 1) AS stopped
+       coalesce(bool_or(category = 0 AND type = 0), false) AS started,
+       coalesce(bool_or(category = 0 AND type = 1), false) AS stopped
 FROM veltra.events
 WHERE session_id IS NOT NULL
-GROUP BY session_id, session_path;
+GROUP BY client_id, session_id, session_path;
 
--- The share of sessions that report, as their stop messages tell it: a session reports if a number drawn from 0 to 1 is
--- at most its threshold; a negative threshold is none, and all report. Each session that reports stands for 1/threshold sessions:
--- "expected" is how many there were, for those whose stop message has the threshold.
+-- The share of sessions that report, as their stop messages tell it. A session reports if a number drawn from 0 to 1 is at
+-- most its threshold, so one that reports with the threshold 0.1 stands for ten; without a threshold (-1) all report.
+-- "expected" is how many there were for those that reported. It is null if some stop message does not say its threshold, or says
+-- 0, with which only messages that override sampling report; "share" is then that of the others.
 CREATE OR REPLACE VIEW veltra.sampled AS
 SELECT date_trunc('day', received, 'UTC') AS day, sender, via,
        count(*) AS sessions,
-       count(threshold) / sum(1 / threshold) AS share,
-       sum(1 / threshold) AS expected
+       round(count(stands_for) / sum(stands_for), 4) AS share,
+       CASE WHEN count(stands_for) = count(*) THEN round(sum(stands_for), 1) END AS expected
 FROM (SELECT received, sender, via,
-             CASE WHEN jsonb_typeof(fields->'SamplingThreshold') = 'number' THEN
-               CASE WHEN (fields->>'SamplingThreshold')::numeric < 0 THEN 1
-                    ELSE nullif(least((fields->>'SamplingThreshold')::numeric, 1), 0) END
-             END AS threshold
-      FROM veltra.events WHERE category = 0 AND type = 1) AS stops
+             CASE WHEN threshold < 0 OR threshold > 1 THEN 1 ELSE 1 / nullif(threshold, 0) END AS stands_for
+      FROM (SELECT received, sender, via,
+                   CASE WHEN jsonb_typeof(fields->'SamplingThreshold') = 'number'
+                        THEN (fields->>'SamplingThreshold')::numeric END AS threshold
+            FROM veltra.events WHERE category = 0 AND type = 1) AS stops) AS weighed
 GROUP BY 1, 2, 3;
 
--- Loss as the fleet sees it: a session's back end numbers its messages from 1, so numbers that are missing below the highest
--- one did not arrive, or not yet, or were not to be reported. Each label ("via") is counted apart; where a session went on under
--- another label, as after a new storebag, its numbers go on, too. Two back ends without labels of their own hide each other's loss,
--- and so does a session of more than 65,535 messages its own.
+-- Loss as the fleet sees it. A session's back end numbers its messages from 1, and after 65,535 from 0, also over a change of
+-- storebags. What is missing below the highest number was lost, is still on its way, or was never meant to leave: a back end
+-- that does not report numbers its messages as well. "via" is the back end: the label without its version ("main" of
+-- "main-v42"). Two back ends of a session that have the same label, or none, hide each other's loss, and so does a hole of more than
+-- 32,767 numbers. Of a session that began before the first day that is kept, what is missing before its first event is not counted.
 CREATE OR REPLACE VIEW veltra.gaps AS
-SELECT session_id, via, client_id, sender, highest, arrived, highest - before - arrived AS missing
-FROM (SELECT numbers.*,
-             coalesce((SELECT max(event_number) FROM veltra.events e
-                       WHERE e.session_id = numbers.session_id AND e.client_id = numbers.client_id
-                         AND e.via IS DISTINCT FROM numbers.via AND e.event_number BETWEEN 1 AND numbers.lowest - 1
-                         AND NOT EXISTS (SELECT FROM veltra.events o
-                                         WHERE o.session_id = e.session_id AND o.client_id = e.client_id
-                                           AND o.via IS NOT DISTINCT FROM e.via AND o.event_number >= numbers.lowest)), 0) AS before
-      FROM (SELECT session_id, via, client_id, min(sender) AS sender, min(event_number) AS lowest,
-                   max(event_number) AS highest, count(DISTINCT event_number) AS arrived
-            FROM veltra.events
-            WHERE session_id IS NOT NULL AND event_number >= 1
-            GROUP BY session_id, via, client_id
-            HAVING max(event_number) > count(DISTINCT event_number)) AS numbers) AS counted
-WHERE highest - before > arrived;
+WITH kept AS (
+  SELECT extract(epoch FROM min(to_date(right(inhrelid::regclass::text, 8), 'YYYYMMDD'))) AS since
+  FROM pg_inherits WHERE inhparent = 'veltra.events'::regclass
+), numbered AS (
+  -- On some internal builds a session is the client's number, which comes again: its start tells them apart.
+  SELECT client_id, session_id, nullif(regexp_replace(via, '(^|-)v[0-9]+$', ''), '') AS backend,
+         CASE WHEN jsonb_typeof(fields->'_startTS') = 'number' THEN (fields->>'_startTS')::numeric END AS began,
+         sender, received, seq, index, event_number
+  FROM veltra.events
+  WHERE session_id IS NOT NULL AND event_number BETWEEN 0 AND 65535
+), stepped AS (
+  -- From one arrival to the next, forwards or, of what comes late, backwards: the shorter way around.
+  SELECT *, (event_number - lag(event_number) OVER arrival + 98304) % 65536 - 32768 AS step
+  FROM numbered
+  WINDOW arrival AS (PARTITION BY client_id, session_id, backend, began ORDER BY received, seq, index)
+), placed AS (
+  -- The number as if it went on after 65,535.
+  SELECT *, first_value(event_number) OVER arrival + coalesce(sum(step) OVER arrival, 0) AS place
+  FROM stepped
+  WINDOW arrival AS (PARTITION BY client_id, session_id, backend, began ORDER BY received, seq, index)
+), counted AS (
+  SELECT session_id, backend AS via, client_id, min(sender) AS sender,
+         max(place)::integer AS highest, count(DISTINCT place) AS arrived,
+         max(place) - count(DISTINCT place)
+           - CASE WHEN began >= (SELECT since FROM kept) THEN 0 ELSE min(place) - 1 END AS missing,
+         max(received) AS last_received
+  FROM placed
+  GROUP BY client_id, session_id, backend, began
+)
+SELECT * FROM counted WHERE missing > 0;
 
 -- Which storebags are in use and how a rollout spreads. An event does not say which storebag it comes from; an operator
--- writes a label into the "post_url" of each version ("https://…/events/v42"), which is "via". "library" is the version of the
--- client library.
+-- writes a label with a version into the "post_url" of each ("https://…/events/main-v42"), which is "via". "library" is the version
+-- of the client library. A client that changes within an hour counts with both versions.
 CREATE OR REPLACE VIEW veltra.storebag_versions AS
 SELECT date_trunc('hour', received, 'UTC') AS hour, via, fields->>'_reportVers' AS library, sender,
-       count(DISTINCT client_id) AS clients, count(DISTINCT session_id) AS sessions, count(*) AS events
+       count(DISTINCT client_id) AS clients, count(DISTINCT client_id || '/' || session_id) AS sessions, count(*) AS events
 FROM veltra.events
 GROUP BY 1, 2, 3, 4;

@@ -2,6 +2,8 @@
 // The keys of settings.json, and which of its contents holds. Any thread.
 #include "config/operator_settings.h"
 
+#include <fmt/format.h>
+
 #include <utility>
 
 #include "config/settings_check.h"
@@ -11,14 +13,6 @@ namespace {
 
 using enum KeyType;
 using enum Need;
-
-// A key without effect in this version.
-constexpr Key later(const char* name, KeyType type, Range range, const char* byDefault, const char* meaning,
-                    const char* choices = nullptr) {
-  Key key{name, type, range, optional, byDefault, meaning};
-  key.choices = choices;
-  return key;
-}
 
 template <auto Member>
 constexpr Key chosen(const char* name, const char* choices, const char* byDefault, const char* meaning) {
@@ -119,7 +113,17 @@ constexpr std::array kSettingsKeys{
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
                                         "How event posts are compressed.", &CompressionChoices::kKeys})
         .key,
-    later("jitter", real, {0, 1}, "0", "Share by which refresh cycles and waits are spread, per device."),
+    row<&OperatorChoices::jitter>(
+        {"jitter",
+         real,
+         {0, 1},
+         optional,
+         "0",
+         "Share by which the times between fetches of a storebag are spread, so that devices do not ask at "
+         "once: up to that share of its refresh cycle sooner, or of it later than 900 seconds after a "
+         "failure. "
+         "Each device draws anew for each fetch."})
+        .key,
 };
 
 }  // namespace
@@ -167,8 +171,15 @@ std::shared_ptr<const OperatorChoices> choicesIn(const platform::LocalContent& c
   if (content.warning) found.warnings.insert(found.warnings.begin(), *content.warning);
   for (const std::string& warning : found.warnings) lines.warnings.push_back("Settings: " + warning);
   if (content.kind == Kind::absent) return std::make_shared<const OperatorChoices>();
-  if (!found.error)
-    return std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*content.value.asDictionary()));
+  if (!found.error) {
+    auto choices =
+        std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*content.value.asDictionary()));
+    if (const std::size_t keys = choices->keys.texts.size(); keys > kMostFurtherKeys)
+      lines.warnings.push_back(
+          fmt::format("Settings: {}: \"keys\" names {} files, of which the first {} are used",
+                      content.placeOf({"keys"}), keys, kMostFurtherKeys));
+    return choices;
+  }
   const char* meanwhile = before ? "the last ones stand: " : "no storebag is accepted: ";
   lines.errors.push_back(std::string("Settings could not be read, ") + meanwhile + *found.error);
   return before;

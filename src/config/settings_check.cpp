@@ -92,8 +92,6 @@ class Check {
                                       formats::excerptOfJSON(value, 80).text, *expected);
       return;
     }
-    if (key.read == nullptr && key.inner == nullptr)
-      warn(fmt::format("\"{}\" has no effect in this version", key.name));
     if (key.inner != nullptr) check(*value.asDictionary(), *key.inner);
   }
   void warn(const std::string& what) { _findings.warnings.push_back(_content.placeOf(_path) + ": " + what); }

@@ -17,7 +17,7 @@ namespace veltrad::config {
 struct SettingsFindings {
   // "PATH:LINE:COLUMN: text": no dictionary, a value of a wrong type or out of its range. The first found.
   std::optional<std::string> error;
-  // The same form: keys that the table does not have, and keys that have no effect.
+  // The same form: keys that the table does not have.
   std::vector<std::string> warnings;
 };
 

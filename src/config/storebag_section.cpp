@@ -159,6 +159,11 @@ std::optional<std::string> StorebagSections::whyNotUsed(const StorebagSection& s
   return choices && choices->storebags.expiry ? _trust.whyExpired(section.origin.expires) : std::nullopt;
 }
 
+double StorebagSections::jitter() {
+  const auto choices = _choices.current();
+  return choices ? *choices->jitter : 0;
+}
+
 // Clients can cause it at will.
 void StorebagSections::refuse(std::int32_t clientType) {
   _counters.count(wire::Reason::settings_broken);

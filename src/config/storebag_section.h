@@ -34,6 +34,7 @@ class StorebagSections final : public StorebagSource {
       std::int32_t clientType, const std::optional<std::string>& lastModified) override;
   KeptSection keptStorebag(std::int32_t clientType) override;
   std::optional<std::string> whyNotUsed(const StorebagSection& section) override;
+  double jitter() override;
 
  private:
   void refuse(std::int32_t clientType);

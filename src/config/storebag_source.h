@@ -75,6 +75,8 @@ class StorebagSource {
   // Why a section that was fetched before is not to be used any more: "expired on …". Nothing: it is. Takes
   // leaf locks only.
   virtual std::optional<std::string> whyNotUsed(const StorebagSection&) { return std::nullopt; }
+  // The share, from 0 to 1, by which the waits between fetches are spread. Takes leaf locks only.
+  virtual double jitter() { return 0; }
 };
 
 }  // namespace veltrad::config

@@ -15,6 +15,7 @@
 #include "base/text.h"
 #include "base/version.h"
 #include "config/client_types.h"
+#include "config/owner_gate.h"
 #include "daemon/veltrad_agent.h"
 #include "http/server_records.h"
 #include "wire/constants.h"
@@ -37,16 +38,15 @@ Value textOrNull(const std::string* text) {
   return withoutIncompleteEnd(std::string_view(*text).substr(0, kLongestText));
 }
 
-Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now) {
+Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, double now, double jitter) {
   const bool attempted = record.attempted;
-  const double wait = record.fetchSuccessful ? record.maxAge : kSecondsBetweenAttempts;
   return {{"name", name},
           {"version", textOrNull(record.version ? &*record.version : nullptr)},
           {"age", attempted ? std::abs(now - record.fetchTime) : kNotKnown},
           {"state", !attempted               ? "never"
                     : record.fetchSuccessful ? "successful"
                                              : "failed"},
-          {"nextAttempt", attempted ? record.fetchTime + wait : kNotKnown},
+          {"nextAttempt", attempted ? record.fetchTime + record.wait(jitter) : kNotKnown},
           {"refusal", textOrNull(record.refusal.empty() ? nullptr : &record.refusal)}};
 }
 
@@ -62,10 +62,13 @@ Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
           {"lastOutcome", activity.lastOutcome.empty() ? Value(kNotKnown) : Value(activity.lastOutcome)}};
 }
 
-Dictionary statusOfSession(const ListedSession& listed) {
+Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord& word) {
   const session::FamilyFacts& facts = listed.facts;
   const Dictionary* info = facts.sessionInfo.get();
-  const Dictionary* user = facts.userInfo.get();
+  // The session itself may not have heard the word yet.
+  Dictionary user = facts.userInfo ? *facts.userInfo : Dictionary();
+  config::EditedFields edits;
+  if (word.fields) word.fields->apply(user, edits);
   const auto clientType = info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
   Array backends;
   if (facts.backends) {
@@ -74,8 +77,8 @@ Dictionary statusOfSession(const ListedSession& listed) {
   return {{"id", listed.number},
           {"clientType", clientType ? Value(*clientType) : Value(kNotKnown)},
           {"sessionID", facts.sessionID},
-          {"clientName", textOrNull(user ? user->string(wire::kVeltraUserInfoClientName) : nullptr)},
-          {"serviceName", textOrNull(user ? user->string(wire::kVeltraUserInfoServiceName) : nullptr)},
+          {"clientName", textOrNull(user.string(wire::kVeltraUserInfoClientName))},
+          {"serviceName", textOrNull(user.string(wire::kVeltraUserInfoServiceName))},
           {"backends", std::move(backends)}};
 }
 
@@ -123,7 +126,9 @@ Array statusOfStorebags(StorebagCache& cache, double now) {
   auto records = cache.records();
   for (const std::string& name : config::storebagNames()) records.try_emplace(name);
   Array storebags;
-  for (const auto& [name, record] : records) storebags.push_back(statusOfStorebag(name.c_str(), record, now));
+  const double jitter = cache.jitter();
+  for (const auto& [name, record] : records)
+    storebags.push_back(statusOfStorebag(name.c_str(), record, now, jitter));
   return storebags;
 }
 
@@ -137,7 +142,7 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers) {
   return all;
 }
 
-Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after) {
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after) {
   // With five back ends each and long names, so many sessions stay below a frame's bounds.
   constexpr std::size_t kMost = 200;
   const auto all = agent.sessions();
@@ -152,7 +157,7 @@ Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after) {
       more = true;
       break;
     }
-    Dictionary status = statusOfSession(listed);
+    Dictionary status = statusOfSession(listed, word);
     const auto parent = parents.find(listed.facts.aggregation.get());
     const auto number = parent == parents.end() ? numbers.end() : numbers.find(parent->second);
     if (number != numbers.end()) status.set("parent", number->second);

@@ -7,14 +7,12 @@
 
 #include "config/client_types.h"
 #include "platform/log.h"
+#include "platform/random.h"
 
 namespace veltrad::daemon {
 
-CacheVerdict verdictOfRecord(const StorebagRecord& record, double now) {
-  if (!record.attempted) return CacheVerdict::fetch;
-  const double age = std::abs(now - record.fetchTime);
-  if (record.fetchSuccessful) return age < record.maxAge ? CacheVerdict::serve : CacheVerdict::fetch;
-  return age < kSecondsBetweenAttempts ? CacheVerdict::wait : CacheVerdict::fetch;
+CacheVerdict StorebagCache::verdictOf(const StorebagRecord& record) const {
+  return verdictOfAge(record, platform::timevalToSeconds(_clock.now()), _source.jitter());
 }
 
 std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientType(std::int32_t clientType) {
@@ -25,7 +23,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
     const Lock held(_lock);
     StorebagRecord& record = settledRecord(name);
     const auto section = used(record);
-    const CacheVerdict verdict = verdictOfRecord(record, platform::timevalToSeconds(_clock.now()));
+    const CacheVerdict verdict = verdictOf(record);
     // What has expired while it was fresh is asked for again.
     if (verdict == CacheVerdict::serve && (section || !record.data)) {
       logDebug("storebagForSession: Cached storebag found for client type %d", clientType);
@@ -35,7 +33,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
       logInfo(
           "storebagForSession: Not fetching storebag for client type %d - must wait %d seconds between "
           "attempts",
-          clientType, kSecondsBetweenAttempts);
+          clientType, static_cast<int>(std::ceil(record.wait(_source.jitter()))));
       return section;
     }
     // What is not to be used must come whole, or not at all.
@@ -91,7 +89,7 @@ StorebagCache::Standing StorebagCache::standingForClientType(std::int32_t client
   const auto at = name ? _cachedStorebags.find(name) : _cachedStorebags.end();
   if (at == _cachedStorebags.end()) return {};
   StorebagRecord& record = at->second;
-  const CacheVerdict verdict = verdictOfRecord(record, platform::timevalToSeconds(_clock.now()));
+  const CacheVerdict verdict = verdictOf(record);
   auto section = used(record);
   const bool unused = verdict == CacheVerdict::serve && record.data && !section;
   return {record.data != nullptr, std::move(section), record.version,
@@ -136,11 +134,8 @@ void StorebagCache::recall(std::int32_t clientType, const std::string& name) {
   logInfo("storebagForSession: Storebag '%s' is the one that was kept before the start", name.c_str());
   record.data = std::move(kept.answer.section);
   record.version = std::move(kept.answer.version);
-  record.fetchTime = kept.fetchTime;
-  record.fetchSuccessful = true;
-  record.maxAge = kept.answer.maxAge;
+  record.ended(true, kept.answer.maxAge, kept.fetchTime, platform::kernelUniform());
   record.lastModified = std::move(kept.answer.lastModified);
-  record.attempted = true;
 }
 
 std::map<std::string, StorebagRecord> StorebagCache::records() {
@@ -179,17 +174,15 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::taken(std::int32_t
     return record.data || answer.kind != Kind::fetched ? used(record) : answer.section;
   }
   logDebug("fetchAndCacheStorebag: Storebag max age: %d seconds", answer.maxAge);
-  record.fetchSuccessful = answer.kind != Kind::failed;
+  record.ended(answer.kind != Kind::failed, answer.maxAge, platform::timevalToSeconds(_clock.now()),
+               platform::kernelUniform());
   if (answer.kind == Kind::fetched) {
     record.data = std::move(answer.section);
     record.version = std::move(answer.version);
   } else if (answer.kind == Kind::failed) {
     logError("fetchAndCacheStorebag: Unable to fetch storebag for client type %d", clientType);
   }
-  record.fetchTime = platform::timevalToSeconds(_clock.now());
-  record.maxAge = answer.maxAge;
   if (answer.lastModified) record.lastModified = std::move(answer.lastModified);
-  record.attempted = true;
   record.refusalReason = answer.refusal;
   record.refusal = answer.refusal ? std::move(answer.why) : std::string();
   return used(record);

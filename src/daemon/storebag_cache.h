@@ -8,44 +8,31 @@
 #include <optional>
 #include <string>
 
-#include "backends/https/spool_rules.h"
+#include "backends/https/spool_sections.h"
 #include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "daemon/lock_ranks.h"
+#include "daemon/storebag_age.h"
 #include "platform/clock.h"
 
 namespace veltrad::daemon {
 
 // Made at the first fetch for its name, never removed.
-struct StorebagRecord {
+struct StorebagRecord : StorebagAge {
   // The section that was obtained last. Failures do not remove it.
   std::shared_ptr<const config::StorebagSection> data;
   std::optional<std::string> version;
-  // When the last attempt ended, in seconds since 1970.
-  double fetchTime = 0;
-  bool fetchSuccessful = false;
-  // In seconds.
-  std::int32_t maxAge = 0;
   std::optional<std::string> lastModified;
   // Why the last attempt's storebag was refused by a rule of the operator; empty: it was not.
   std::string refusal;
   std::optional<wire::Reason> refusalReason;
   // It was logged that the section is not to be used any more.
   bool saidUnused = false;
-  // A first attempt has ended.
-  bool attempted = false;
   // What an earlier daemon has kept was looked at.
   bool recalled = false;
   // Requests for this name wait.
   bool beingFetched = false;
 };
-
-enum class CacheVerdict { serve, wait, fetch };
-// Serve a fresh record; wait if the last attempt failed less than 900 s ago; otherwise fetch. The age is
-// absolute, so a record also becomes old if the clock is set back.
-CacheVerdict verdictOfRecord(const StorebagRecord& record, double now);
-
-inline constexpr int kSecondsBetweenAttempts = 900;
 
 class StorebagCache final : public backends::SectionSource {
  public:
@@ -75,6 +62,8 @@ class StorebagCache final : public backends::SectionSource {
   std::optional<wire::Reason> refusalForClientType(std::int32_t clientType);
   // By name; a record being fetched is as its last attempt left it.
   std::map<std::string, StorebagRecord> records();
+  // The operator's, from 0 to 1.
+  double jitter() { return _source.jitter(); }
 
  private:
   config::StorebagSectionAnswer fetched(std::int32_t clientType, const char* name,
@@ -85,6 +74,7 @@ class StorebagCache final : public backends::SectionSource {
   void settle(StorebagRecord& record) REQUIRES(_lock);
   // Waits until the record of this name is not being fetched.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
+  CacheVerdict verdictOf(const StorebagRecord& record) const;
   // The record's section, unless it is not to be used any more.
   std::shared_ptr<const config::StorebagSection> used(StorebagRecord& record) const REQUIRES(_lock);
   // Takes an answer into the record and returns what the session gets.

@@ -23,4 +23,8 @@ class UnseededSequence final : public Random {
   unsigned short _state[3] GUARDED_BY(_mutex) = {0, 0, 0};
 };
 
+// In [0, 1), from the kernel: other numbers on each device and after each start, so that a fleet does not act
+// at once.
+double kernelUniform();
+
 }  // namespace veltrad::platform

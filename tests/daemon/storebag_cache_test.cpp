@@ -41,6 +41,7 @@ struct Source final : config::StorebagSource {
     answer.version = "v" + std::to_string(fetches);
     return answer;
   }
+  double jitter() override { return share; }
   std::optional<std::string> whyNotUsed(const config::StorebagSection&) override {
     return expired ? std::optional<std::string>("expired on Monday") : std::nullopt;
   }
@@ -60,6 +61,7 @@ struct Source final : config::StorebagSource {
   std::optional<std::string> conditional;
   std::string newLastModified;
   std::int32_t age = 3600;
+  double share = 0;
   bool answersNotModified = false;
   bool attempts = true;
   bool hold = false;
@@ -196,8 +198,8 @@ TEST_F(Cache, AFetchThatLackedMemoryIsOverForThoseWhoWait) {
   EXPECT_NE(second, nullptr);
 }
 
-// What a record says a moment after it was fetched, or failed.
-TEST(StorebagRecord, AgeAndOutcomeDecide) {
+// What a storebag's age says a moment after it was fetched, or failed.
+TEST(StorebagAge, AgeAndOutcomeDecide) {
   using enum daemon::CacheVerdict;
   struct Case {
     bool attempted, successful;
@@ -216,13 +218,68 @@ TEST(StorebagRecord, AgeAndOutcomeDecide) {
                                          {true, false, 900, fetch},
                                          {true, false, -899, wait},
                                          {true, false, -901, fetch}}) {
-    daemon::StorebagRecord record;
+    daemon::StorebagAge record;
+    record.ended(c.successful, 100, 5'000, 0.9);
     record.attempted = c.attempted;
-    record.fetchSuccessful = c.successful;
-    record.fetchTime = 5'000;
-    record.maxAge = 100;
-    EXPECT_EQ(daemon::verdictOfRecord(record, 5'000 + c.age), c.verdict) << c.age;
+    EXPECT_EQ(daemon::verdictOfAge(record, 5'000 + c.age, 0), c.verdict) << c.age;
   }
+}
+
+// What comes between two attempts, by how they ended: told 0 means that there was no answer.
+TEST(StorebagAge, JitterSpreadsTheWaits) {
+  struct Attempt {
+    bool successful;
+    std::int32_t told;
+  };
+  struct Case {
+    std::vector<Attempt> attempts;
+    double jitter, draw, wait;
+  };
+  const Attempt hour{true, 3'600}, failure{false, 0};
+  for (const Case& c :
+       std::vector<Case>{{{hour}, 0, 0.5, 3'600},
+                         {{hour}, 0.5, 0, 3'600},
+                         {{hour}, 0.5, 0.5, 2'700},
+                         {{hour}, 1, 0.75, 900},
+                         {{{true, 0}}, 1, 0.5, 0},
+                         {{failure}, 0, 0.5, 900},
+                         {{failure}, 0.5, 0.5, 1'125},  // nothing was ever told
+                         {{hour, failure}, 0, 0.5, 900},
+                         {{hour, failure}, 0.5, 0, 900},
+                         {{hour, failure}, 0.5, 0.5, 1'800},
+                         {{hour, failure, failure}, 1, 0.5, 2'700},
+                         {{hour, {false, 60}}, 1, 0.5, 2'700},  // what a failure was told counts not
+                         {{{true, 60}, failure}, 1, 0.5, 1'350},
+                         {{{true, 1'000'000}, failure}, 1, 0.5, 44'100},
+                         {{failure, hour}, 0.5, 0.5, 2'700}}) {
+    daemon::StorebagAge age;
+    for (const Attempt& attempt : c.attempts) age.ended(attempt.successful, attempt.told, 5'000, c.draw);
+    EXPECT_DOUBLE_EQ(age.wait(c.jitter), c.wait);
+    if (c.wait > 0) {
+      const auto before = daemon::verdictOfAge(age, 5'000 + c.wait - 0.001, c.jitter);
+      EXPECT_EQ(before,
+                c.attempts.back().successful ? daemon::CacheVerdict::serve : daemon::CacheVerdict::wait);
+    }
+    EXPECT_EQ(daemon::verdictOfAge(age, 5'000 + c.wait, c.jitter), daemon::CacheVerdict::fetch);
+  }
+}
+
+// 40 storebags that were fetched at one time become old at different ones.
+TEST_F(Cache, EachFetchDrawsAnew) {
+  source.share = 0.5;
+  source.age = 100;
+  int later = 0;
+  for (int fetch = 1; fetch <= 40; ++fetch) {
+    ask(7);
+    EXPECT_EQ(source.fetches, fetch);
+    clock.advance(49.9);
+    ask(7);
+    EXPECT_EQ(source.fetches, fetch);
+    clock.advance(25.1);
+    later += !cache.standingForClientType(7).due;
+    clock.advance(25.1);
+  }
+  EXPECT_TRUE(later > 0 && later < 40) << later;
 }
 
 TEST_F(Cache, OthersGoOnDuringADownloadAndTheSameNameWaits) {

@@ -1,9 +1,11 @@
 # SPDX-License-Identifier: Apache-2.0
 """What an administrator says under etc/veltrad: both forms of a file, SIGHUP, settings.json."""
+import json
 import os
 import signal
+import time
 
-from harness import ENTITLEMENT, SystemTest, closed_port
+from harness import ENTITLEMENT, SystemTest, closed_port, storebag, wait_until
 
 SETTINGS = "etc/veltrad/settings.json"
 KEPT = "var/lib/veltrad/storebags/ostvane"
@@ -47,13 +49,14 @@ class Configuration(SystemTest):
                               ('{"keys": ["a", 1]}', '2:2: "keys" is ["a",1]: expected an array of texts'),
                               ("{", "2:2: "), ("[]", "1:1: the outermost value is not a dictionary")):
             self.root.write(SETTINGS, comments(broken))
-            with self.subTest(broken), self.serving("Settings", "No storebag is accepted for client type 6") as daemon:
+            with self.subTest(broken), self.serving("Settings", "No storebag is accepted for client type 6",
+                                                    "Storebag key not used: ") as daemon:
                 self.assertIsNone(self.open(6)[1])
                 daemon.wait_for_line(f"no storebag is accepted: {self.root.path}/{SETTINGS}:{place}")
-                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1, "jitter": 0.5}')
+                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1, "keys": ["k"%s]}' % (b', "k"' * 16))
                 self.assertEqual(self.open(6)[1], ["httppost"])
                 daemon.wait_for_line(':1:23: unknown key "speed": expected one of sampling, storebags, ')
-                daemon.wait_for_line(':1:35: "jitter" has no effect in this version')
+                daemon.wait_for_line(':1:35: "keys" names 17 files, of which the first 16 are used')
                 self.root.write(SETTINGS, comments(broken))
                 self.assertEqual(self.open(7)[1], ["httppost"])
                 daemon.wait_for_line("Settings could not be read, the last ones stand: ")
@@ -174,3 +177,40 @@ class Refresh(SystemTest):
         with self.serving():  # no longer fresh: asked for again, on the terms of what is kept
             self.assertEqual(self.open(6)[1], ["httppost"])
         self.assertEqual(self.lab.received("storebags")[-1]["outcome"], "304")
+
+
+class Jitter(SystemTest):
+    CYCLE = 1000
+
+    def refresh(self, status=0):
+        """Seconds from this fetch to the next attempt, as the daemon says."""
+        self.ctl("refresh", "ostvane", status=status)
+        told = next(one for one in json.loads(self.ctl("status", "--json")[0])["storebags"] if one["name"] == "ostvane")
+        return told["nextAttempt"] - (time.time() - told["age"])
+
+    def expect(self, least, most, status=0):
+        """Draws until one wait lies well below the middle and one well above it."""
+        waits, near = [], (most - least) / 4
+        wait_until(lambda: waits.append(self.refresh(status)) or
+                   min(waits) < least + near and max(waits) > most - near, f"waits of all lengths: {waits}")
+        self.assertTrue(least - 1 < min(waits) and max(waits) < most + 1, waits)
+
+    def test_waits_are_spread_and_a_fetch_comes_within_its_cycle(self):
+        self.lab.put("ostvane", {"refresh_cycle": self.CYCLE, **storebag()})
+        with self.serving("fetchStorebag", "Unable to fetch storebag", "Could not fetch storebag", "Error resolving") as daemon:
+            self.assertEqual({round(self.refresh()) for _ in range(3)}, {self.CYCLE})
+            self.root.write(SETTINGS, b'{"jitter": 0.5}')
+            self.expect(self.CYCLE / 2, self.CYCLE)
+            self.lab.control(path="/storebags", cut=True)
+            self.expect(900, 900 + self.CYCLE / 2, status=1)
+            line = "Not fetching storebag for client type 6 - must wait "
+            self.open(6)
+            said = int(daemon.wait_for_line(line).split(line)[1].split()[0])
+            self.assertTrue(900 <= said <= 900 + self.CYCLE / 2, said)
+            self.lab.reset()
+            # An open session that follows gets it fetched that much sooner.
+            self.lab.put("ostvane", {"refresh_cycle": 30, **storebag()})
+            self.root.write(SETTINGS, b'{"jitter": 1, "storebags": {"openSessions": "follow"}}')
+            wait_until(lambda: self.refresh() < 3, "a short wait")
+            fetches = len(self.lab.received("storebags"))
+            self.lab.received("storebags", fetches + 1, 10)

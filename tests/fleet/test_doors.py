@@ -7,11 +7,13 @@ import os
 import pathlib
 import plistlib
 import re
+import signal
 import socket
 import subprocess
 import tempfile
 import time
 import unittest
+import urllib.parse
 import urllib.request
 
 import side
@@ -93,6 +95,17 @@ class Doors(FleetTest):
         self.assertEqual(self.fleet.query("SELECT count(*) FROM veltra.posts"
                                           f" WHERE encode(id, 'hex') = '{identifier}'"), [["1"]])
 
+    def test_files_are_kept_once_whatever_they_are_called(self):
+        door, path = self.direct(), "/upload?uuid=names&sequence=1&raw=true&filename="
+        names = ["Nats-Msg-Id", "Nats-Msg-Id:x", "Nats-Rollup:all", "\\Nats-"]
+        rows = [(name, b"content") for name in names * 2] + [("a", b"bc"), ("ab", b"c"), ("last", b"")]
+        for name, content in rows:
+            answer = door.request("POST", path + urllib.parse.quote(name), packed(content), GZIP)
+            self.assertEqual((answer.status, answer.body), (200, b'{"success":true}'), name)
+        self.rows("SELECT 1 FROM veltra.files WHERE filename = 'last'", 1)
+        self.assertEqual([name for name, in self.fleet.query("SELECT filename FROM veltra.files WHERE uuid = 'names' ORDER BY seq")],
+                         [*names, "a", "ab", "last"])
+
     def test_bodies_larger_than_a_message(self):
         text = os.urandom(3 << 20).hex()
         self.assertEqual(self.direct().post("/events", packed(envelope({"t": text}, client="large")), Content_Encoding="gzip").status, 200)
@@ -102,7 +115,7 @@ class Doors(FleetTest):
         body = packed(content)
         answer = self.through().request("POST", "/upload?uuid=ab&sequence=7&description=a%20log&filename=a%20b.gz&raw=true", body, GZIP)
         self.assertEqual((answer.status, answer.body), (200, b'{"success":true}'))
-        [row] = self.rows("SELECT uuid, sequence, filename, description, encode(sha256, 'hex'), bytes, path FROM veltra.files", 1)
+        [row] = self.rows("SELECT uuid, sequence, filename, description, encode(sha256, 'hex'), bytes, path FROM veltra.files WHERE uuid = 'ab'", 1)
         self.assertEqual(row[:6], ["ab", "7", "a b.gz", "a log", hashlib.sha256(content).hexdigest(), str(len(content))])
         self.assertEqual(gzip.decompress((pathlib.Path(self.line["files"]) / row[6]).read_bytes()), content)
         items = ["a line", {"level": 3, "nul": "\0"}, ["x" * 2_000_000]]
@@ -112,28 +125,6 @@ class Doors(FleetTest):
         self.assertRegex(answer.body.decode(), "^/logdata/[0-9a-f]+$")
         [[found]] = self.rows(f"SELECT items FROM veltra.log_data WHERE location = '{answer.body.decode()}'", 1)
         self.assertEqual(json.loads(found), ["a line", {"level": 3, "nul": "�"}, ["x" * 2_000_000]])
-
-    def test_views_answer_what_has_come(self):
-        def event(session, number, kind=10, **more):
-            return {"_sender": "ZZ", "_sessionID": session, "_eventNumber": number, "_method": 0 if kind < 10 else 5, "_status": kind, **more}
-        labels = {"a": [event("G", 1), event("G", 2), event("G", 4), event("H", 1), event("H", 2), event("R", 1), event("R", 2)],
-                  "b": [event("G", 6), event("G", 7), event("R", 3), event("R.S", 1, 0)],
-                  "stops": [event(f"S{at}", 1, 1, SamplingThreshold=share) for at, share in enumerate([1, 0.1, 0.1, -1, 2, "none"])]}
-        for label, events in labels.items():
-            self.assertEqual(self.through().post(f"/events/{label}", envelope(*events, client="views")).status, 200)
-        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'views'", 17)
-        for view, columns, rows in (
-                ("gaps", "session_id, via, highest, arrived, missing", ["G a 4 3 1", "G b 7 2 1"]),
-                ("sampled", "via, sessions, round(share, 4), round(expected)", [f"stops 6 {5 / 23:.4f} 23"]),
-                ("sessions", "session_id, tree, parent, depth, events, started, stopped",
-                 ["G G  0 5 f f", "H H  0 2 f f", "R R  0 3 f f", "R.S R R 1 1 t f", *(f"S{at} S{at}  0 1 f t" for at in range(6))]),
-                ("events_by_hour", "sum(events), max(clients)", ["17 1"]),
-                ("storebag_versions", "via, sum(sessions), sum(events)", ["a 3 7", "b 3 4", "stops 6 6"])):
-            with self.subTest(view=view):
-                grouped = "GROUP BY via" if view == "storebag_versions" else ""
-                found = self.fleet.query(f"SELECT {columns} FROM veltra.{view} WHERE sender = 'ZZ' {grouped} ORDER BY 1"
-                                         + (", 2" if view == "gaps" else ""))
-                self.assertEqual([" ".join(row) for row in found], rows)
 
     def test_datagrams(self):
         dashboard = Dashboard(self.line["dashboard"])
@@ -150,6 +141,16 @@ class Doors(FleetTest):
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
         self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
         self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
+
+    def test_storebags_go_back(self):
+        door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
+        self.fleet.publish("ostvane", bags[0])
+        first = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.publish("ostvane", bags[1])
+        second = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.storebag("rollback", "ostvane", "bags")
+        back = door.request("GET", "/bags/maple/ostvane", headers={"If-Modified-Since": second.headers["Last-Modified"]})
+        self.assertEqual((back.status, back.body), (200, first.body))
 
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
@@ -248,3 +249,37 @@ class Alone(unittest.TestCase):
             process.terminate()
             self.assertTrue(waiting.recv(100).startswith(b"HTTP/1.1 429"))
         self.assertEqual(process.wait(15), 0)
+
+    def test_a_file_is_refused_as_soon_as_a_piece_was_not_taken(self):
+        _, door, _ = self.gateway()
+        with socket.create_connection(door.address, timeout=10) as sending:
+            sending.sendall(b"POST /upload?sequence=1 HTTP/1.1\r\nHost: h\r\nContent-Encoding: gzip\r\nContent-Length: %d\r\n\r\n" % (1 << 30))
+            sending.sendall(packed(os.urandom(2_500_000)))
+            self.assertTrue(sending.recv(1000).startswith(b"HTTP/1.1 429"))
+
+    def test_small_bodies_that_become_large_cost_little(self):
+        process, door, _ = self.gateway("--hold-bytes", str(1 << 30))
+        values = b'{"clientId":"c","events":[' + b"1," * ((8 << 20) - 20) + b"1]}"
+        texts = plistlib.dumps(["\1" * (1 << 20)] * 8, fmt=plistlib.FMT_BINARY)
+        zipped = {**JSON, "Content-Encoding": "gzip"}
+        for path, body, headers, status in (("/events", packed(values), zipped, 400), ("/logdata", packed(texts), GZIP, 413),
+                                            ("/upload?sequence=1", gzip.compress(bytes(40 << 20)), GZIP, 413)):
+            with self.subTest(path=path):
+                self.assertLess(len(body), 100_000)
+                answer = door.request("POST", path, body, headers)
+                self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
+        status = pathlib.Path(f"/proc/{process.pid}/status").read_text()
+        self.assertLess(int(re.search(r"VmHWM:\s+(\d+) kB", status)[1]), 250_000)
+
+    def test_datagrams_that_the_kernel_dropped_are_counted(self):
+        process, _, line = self.gateway("--dashboard", "127.0.0.1:0")
+        dashboard = Dashboard(line["dashboard"])
+        process.send_signal(signal.SIGSTOP)
+        for number in range(20_000):
+            dashboard.socket.send(datagram(1, b" a=" + b"x" * 1000))
+        process.send_signal(signal.SIGCONT)
+
+        def dropped():
+            dashboard.socket.send(datagram(2))
+            return re.search(rb'datagrams_total{result="dropped"} [1-9]', urllib.request.urlopen(line["admin"] + "/metrics").read())
+        side.wait_until(dropped, "the number of those that were dropped", 20)

@@ -22,7 +22,7 @@ std::optional<std::uint64_t> EventBatch::oldestTurn() const {
 
 bool EventBatch::thresholdReached(std::int32_t method, std::int32_t threshold) const {
   const auto at = _counts.find(method);
-  return (at == _counts.end() ? 0 : at->second) > threshold;
+  return isReached(at == _counts.end() ? 0 : at->second, threshold);
 }
 
 bool EventBatch::full(const EventSize& event) const {

@@ -43,8 +43,9 @@ class EventBatch {
   // The turn with which the oldest event was added.
   std::optional<std::uint64_t> oldestTurn() const;
 
-  // Whether a flush must come before the next event of this method, because more than `threshold` (signed)
-  // were added since the counts were last cleared.
+  // Whether a flush must come before the next event of a method, because more than `threshold` (signed) were
+  // added since the counts were last cleared.
+  static bool isReached(std::int32_t added, std::int32_t threshold) { return added > threshold; }
   bool thresholdReached(std::int32_t method, std::int32_t threshold) const;
   // Whether the event would exceed a bound.
   bool full(const EventSize& event) const;

@@ -14,8 +14,6 @@ namespace veltrad::gateway {
 namespace {
 
 constexpr std::size_t kEscapeLength = 6;
-// A parsed value takes some 40 bytes; 16 MiB of text can hold millions.
-constexpr std::size_t kMostValues = 1'500'000;
 
 // At least as many as there are, without parsing.
 std::size_t valuesIn(std::string_view text) {

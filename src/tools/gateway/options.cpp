@@ -84,8 +84,9 @@ void describeServing(CLI::App& app, ServeArguments& given) {
       ->type_name("SECONDS")
       ->check(CLI::Range(0.1, 60.0))
       ->capture_default_str();
-  app.add_option("--hold-bytes", given.holdBytes,
-                 "What is held together, and what is received together; half of it for files")
+  app.add_option(
+         "--hold-bytes", given.holdBytes,
+         "What is held together; as much for events from their head to the answer, half of it for the rest")
       ->type_name("BYTES")
       ->check(CLI::Range(std::size_t{64} << 20, std::size_t{1} << 40))
       ->capture_default_str();

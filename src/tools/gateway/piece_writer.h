@@ -15,12 +15,15 @@ namespace veltrad::gateway {
 
 // Less than 1 MiB, which a server of the stream takes unless it is told otherwise.
 inline constexpr std::size_t kPieceBytes = 960u << 10;
+// Of one body that comes slower than it is published.
+inline constexpr std::size_t kMostPiecesUnderWay = 2;
 
 // One thread adds and commits; answers come on others. The publisher must outlive it.
 class PieceWriter {
  public:
   explicit PieceWriter(Publisher& publisher) : _shared(std::make_shared<Shared>(publisher)) {}
 
+  // Publishes each piece when it is full, as long as the stream has taken those before.
   void add(std::string_view bytes);
   // False: several pieces wait for the stream. `resume` is then called once, when fewer do.
   bool hasRoom(std::function<void()> resume);

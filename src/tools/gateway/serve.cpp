@@ -58,8 +58,8 @@ HeldMessages::Bounds heldBounds(const ServeArguments& given) {
 
 BodyBounds bodyBounds(const ServeArguments& given) {
   BodyBounds bounds;
-  bounds.together = given.holdBytes;
-  bounds.files = given.holdBytes / 2;
+  bounds.eventsTogether = given.holdBytes;
+  bounds.othersTogether = given.holdBytes / 2;
   return bounds;
 }
 

@@ -122,7 +122,8 @@ std::size_t TableRows::bytes() const {
 
 void TableRows::clear() {
   // The memory goes, too; an assignment would keep it.
-  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts}) std::string().swap(*rows);
+  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts})
+    std::string().swap(*rows);
 }
 
 Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string body) {

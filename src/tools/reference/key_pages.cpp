@@ -55,14 +55,14 @@ std::string choicesOf(const Key& key) {
   return text + "\"";
 }
 
-std::string item(const Key& key, const char* unread) {
+std::string item(const Key& key) {
   const bool required = key.need == config::Need::required;
   std::string type = nameOf(key.type);
   if (key.range.least < key.range.most) type += fmt::format(", {} to {}", key.range.least, key.range.most);
   if (key.choices) type = choicesOf(key);
-  return fmt::format("- **{}** ({}{}): {} Without it: {}{}\n", escaped(key.name), type,
+  return fmt::format("- **{}** ({}{}): {} Without it: {}\n", escaped(key.name), type,
                      required ? ", required" : "", sentence(escaped(key.meaning)),
-                     sentence(escaped(key.byDefault)), key.read == nullptr ? unread : "");
+                     sentence(escaped(key.byDefault)));
 }
 
 // A table, and the keys whose dictionaries have it.
@@ -81,14 +81,14 @@ std::string heading(const Level& level) {
 
 }  // namespace
 
-std::string keysOf(const KeyTable& table, const char* unread) {
+std::string keysOf(const KeyTable& table) {
   std::vector<Level> levels{{&table, {}}};
   std::string page;
   for (std::size_t i = 0; i < levels.size(); ++i) {
     if (i > 0) page += '\n' + heading(levels[i]);
     const KeyTable& keys = *levels[i].table;
     for (const Key& key : keys) {
-      page += item(key, unread);
+      page += item(key);
       if (key.inner == nullptr) continue;
       const auto same = [&key](const Level& level) { return level.table == key.inner; };
       auto level = std::find_if(levels.begin(), levels.end(), same);

@@ -8,9 +8,8 @@
 
 namespace veltrad::reference {
 
-// The keys of the table and of all tables inside it, each of these under a heading of its own. `unread` is
-// added to the keys that the daemon does not read.
-std::string keysOf(const config::KeyTable& table, const char* unread = "");
+// The keys of the table and of all tables inside it, each of these under a heading of its own.
+std::string keysOf(const config::KeyTable& table);
 // A table of the client types: number, storebag and sender code.
 std::string preferences();
 std::string clientTypes();

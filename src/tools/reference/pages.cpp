@@ -28,8 +28,6 @@ constexpr std::string_view kBegin = "<!-- made: ";
 constexpr std::string_view kBeginEnd = " -->";
 constexpr std::string_view kEnd = "<!-- end -->";
 
-constexpr const char* kNotYet = " No effect in this version.";
-
 struct Part {
   std::string_view name;
   std::string (*make)();
@@ -47,8 +45,8 @@ constexpr Part kParts[] = {
     {"commands of veltra-gateway", [] { return commandsOf(gateway::commandLine()); }},
     {"keys of a storebag", [] { return keysOf(config::Storebag::kKeys); }},
     {"findings of lint", findings},
-    {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys, kNotYet); }},
-    {"keys of the policy", [] { return keysOf(config::PolicyRules::kKeys, kNotYet); }},
+    {"keys of settings", [] { return keysOf(config::OperatorChoices::kKeys); }},
+    {"keys of the policy", [] { return keysOf(config::PolicyRules::kKeys); }},
     {"preferences", preferences},
     {"client types", clientTypes},
     {"environments", environments},

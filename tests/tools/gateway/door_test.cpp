@@ -2,10 +2,12 @@
 // What a request's head decides, and what a datagram becomes.
 #include <gmock/gmock.h>
 
+#include "base/property_list.h"
 #include "formats/json.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
 #include "gateway/table_rows.h"
+#include "support/gzip.h"
 
 namespace veltrad::gateway {
 namespace {
@@ -84,6 +86,88 @@ TEST(Door, ReadsWhatTheRequestSays) {
                BodyBounds());
   EXPECT_EQ(file.value().query.at("filename"), "a b.gz");
   EXPECT_EQ(file.value().query.at("description"), "Callwyn QBSL");
+}
+
+// A door whose stream cannot be reached, with little room.
+class Room : public testing::Test {
+ protected:
+  static constexpr std::size_t kHeldBytes = 2u << 20;
+
+  Room()
+      : publisher(
+            Publisher::open({.servers = {"nats://127.0.0.1:1"}}, {.bytes = kHeldBytes}, metrics).value()),
+        door(*publisher, metrics,
+             {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429) {}
+  // No completion comes after what it uses.
+  ~Room() override { publisher.reset(); }
+
+  // The taker, or nothing: refused with 429.
+  std::unique_ptr<BodyTaker> open(const FakeHead& head) {
+    auto handled = door.request(head);
+    if (const auto* refusal = std::get_if<Answer>(&handled)) EXPECT_EQ(refusal->status, 429);
+    auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled);
+    return taker ? std::move(*taker) : nullptr;
+  }
+  // The status of the refusal; 0: the whole is held.
+  static int post(BodyTaker& taker, std::string_view body) {
+    while (!body.empty()) {
+      if (const auto refusal = taker.take(body)) return refusal->status;
+    }
+    const auto status = std::make_shared<int>(0);
+    taker.finish([status](const Answer& answer) { *status = answer.status; });
+    return *status;
+  }
+
+  Metrics metrics;
+  std::unique_ptr<Publisher> publisher;
+  Door door;
+  const FakeHead upload = head("/upload?sequence=1", {{"Content-Encoding", "gzip"}});
+};
+
+TEST_F(Room, OfEventsIsNotTakenByFiles) {
+  auto large = open(upload);
+  ASSERT_TRUE(large);
+  EXPECT_FALSE(open(upload));
+  FakeHead small = upload;
+  small.bytes = 1'000;
+  EXPECT_TRUE(open(small)) << "what it can keep at most is known";
+  EXPECT_TRUE(open(head("/events")));
+  large.reset();
+  EXPECT_TRUE(open(upload));
+}
+
+TEST_F(Room, IsTakenByWhatABodyKeeps) {
+  const std::string start = R"({"clientId":"c","events":[]})";
+  const auto first = open(head("/events")), second = open(head("/events"));
+  EXPECT_EQ(post(*first, start + std::string(40'000, ' ')), 0);
+  EXPECT_EQ(post(*second, start + std::string(40'000, ' ') + "\n"), 429);
+  const auto packed = open(head("/events", {{"Content-Encoding", "gzip"}}));
+  EXPECT_FALSE(packed) << "the first is held still, and zlib needs more than is left";
+  EXPECT_EQ(publisher->held(), 1u);
+}
+
+TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
+  for (const auto& [length, status] : {std::pair(16'000u, 0), {17'000u, 413}}) {
+    const auto list = writeBinaryPropertyList(Array{std::string(length, '\x01')});
+    EXPECT_EQ(post(*open(head("/logdata")), list), status) << length;
+  }
+}
+
+TEST_F(Room, EndsAFileOfWhichAPieceWasNotTaken) {
+  std::string content;
+  for (std::uint32_t number = 1; content.size() < 3 * kHeldBytes; number = number * 1'664'525 + 1'013'904'223)
+    content += static_cast<char>(number >> 24);
+  const std::string packed = *support::GzipCompressor().gzipDeflate({content}, 1);
+  std::string_view rest = packed;
+  const auto taker = open(upload);
+  std::optional<Answer> refusal;
+  while (!refusal && !rest.empty()) {
+    std::string_view piece = rest.substr(0, 10'000);
+    rest.remove_prefix(piece.size());
+    while (!refusal && !piece.empty()) refusal = taker->take(piece);
+  }
+  EXPECT_EQ(refusal.value_or(Answer()).status, 429);
+  EXPECT_EQ(publisher->held(), 2u) << "of 960 KiB each";
 }
 
 TEST(Datagrams, BecomeTheSameMessageWheneverTheyAreSent) {
