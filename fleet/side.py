@@ -18,7 +18,7 @@ import urllib.request
 
 HERE = pathlib.Path(__file__).resolve().parent
 SOURCE = HERE.parent
-BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "release"))
+BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "release")).resolve()
 STREAMS = ["stream1", "stream2", "stream3"]
 GATEWAYS = ["gateway1", "gateway2"]
 NAMES = ["nginx", *STREAMS, *GATEWAYS, "drain", "postgres", "daemon"]

@@ -189,6 +189,18 @@ class Alone(unittest.TestCase):
                                      capture_output=True, text=True)
             self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
 
+    def test_connections_between_requests_keep_little(self):
+        process, first, _ = self.gateway()
+
+        def resident():
+            return int(re.search(r"^VmRSS:\s+(\d+)", pathlib.Path(f"/proc/{process.pid}/status").read_text(), re.M)[1])
+        self.assertEqual(first.post("/events", b"{}").status, 400)
+        before, doors = resident(), [Door(first.address) for _ in range(600)]
+        for door in doors:
+            self.addCleanup(door.close)
+        self.assertEqual({door.post("/events", b"{}").status for door in doors}, {400})
+        self.assertLess((resident() - before) / len(doors), 9, "KiB; the room for a body is 16")
+
     def gateway(self, *arguments, hold="0.5", listen="127.0.0.1:0"):
         process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", listen,
                                     "--admin", "127.0.0.1:0", "--hold", hold, *arguments], stdout=subprocess.PIPE,

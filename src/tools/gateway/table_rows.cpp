@@ -121,8 +121,9 @@ std::size_t TableRows::bytes() const {
 }
 
 void TableRows::clear() {
-  // The memory goes, too.
-  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts}) *rows = {};
+  // The memory goes, too; an assignment would keep it.
+  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts})
+    std::string().swap(*rows);
 }
 
 Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string body) {
