@@ -130,9 +130,10 @@ def memory(fleet, count):
     for words, port, context in (("of its own", listen, None), ("through nginx", fleet.facts["https"], tls)):
         rest, open_ = resident(pid), []
         nginx = sum(resident(int(one)) for one in pathlib.Path(f"/proc/{fleet.facts['pids']['nginx']}/task/{fleet.facts['pids']['nginx']}/children").read_text().split())
+        good = 0
         for _ in range(count):
             open_.append(connect(port, context))
-        good = sum(post(connection, content) for connection in open_)
+            good += post(open_[-1], content)
         after = resident(pid)
         more = sum(resident(int(one)) for one in pathlib.Path(f"/proc/{fleet.facts['pids']['nginx']}/task/{fleet.facts['pids']['nginx']}/children").read_text().split()) - nginx
         print(f"{count:,} connections {words}, {good:,} answered: gateway {rest:,} KiB before, {after:,} KiB with them "
@@ -149,6 +150,8 @@ def main():
     hard = resource.getrlimit(resource.RLIMIT_NOFILE)[1]
     resource.setrlimit(resource.RLIMIT_NOFILE, (hard, hard))
     fleet = side.Fleet.make()
+    conf = fleet.path / "nginx/nginx.conf"
+    conf.write_text(conf.read_text().replace("keepalive_timeout 75s", "keepalive_timeout 900s"))  # until all are open
     try:
         fleet.start([name for name in side.NAMES if name != "daemon"])
         memory(fleet, given.connections)

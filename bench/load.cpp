@@ -1,15 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 // A client that sends as it is told, and the bare socket beside it. Each way prints one JSON object a line.
-// Usage: load trips ROOT CLIENT-TYPE CORE ROUNDS (sends with reply and bare trips in turn; CORE: of the bare
-// end
-//          and -1: any; this end is on core 0 unless it is -1)
-//        load flood ROOT CLIENT-TYPE SESSIONS MESSAGES (prints {"sessions"}, then sends at each line of
-//        standard
-//          input, without replies, prints the time until the last is taken in, and ends with its input)
-//        load waits ROOT CLIENT-TYPE SESSIONS MESSAGES (the same with replies, one at a time)
-//        load posts ROOT CLIENT-TYPE SESSIONS MESSAGES (the same, with a flush after each message)
-//        load latency ROOT CLIENT-TYPE RATE SECONDS (RATE 0: as fast as replies come)
-//        load bare CORE 0 RATE SECONDS (this end of both is on core 0)
+// Usage: load WAY ROOT CLIENT-TYPE A B, where WAY A B is one of
+//   trips CORE ROUNDS       sends with reply and bare trips in turn; the bare end is on CORE (-1: any), and
+//                           this end is on core 0 unless CORE is -1
+//   flood SESSIONS MESSAGES prints {"sessions"}, then sends at each line of standard input, without replies,
+//                           prints the time until the last is taken in, and ends with its input
+//   waits SESSIONS MESSAGES the same with replies, one at a time
+//   posts SESSIONS MESSAGES the same, with a flush after each message
+//   latency RATE SECONDS    RATE 0: as fast as replies come
+// or load bare CORE 0 RATE SECONDS; this end of both is on core 0.
 #include <fmt/format.h>
 #include <sched.h>
 #include <sys/prctl.h>

@@ -30,7 +30,7 @@ def publish(fleet):
 
 def control(fleet, *arguments, input=None):
     done = subprocess.run([side.program("veltractl"), "--root", str(fleet.path / "root"), *arguments], input=input,
-                          capture_output=True, text=True, timeout=60)
+                          capture_output=True, text=True, timeout=60, start_new_session=True)
     if done.returncode != 0:
         raise AssertionError(f"veltractl {' '.join(arguments)}: {done.stderr}{done.stdout}")
     return done.stdout
@@ -40,14 +40,18 @@ def play(fleet):
     control(fleet, "session", *PHONE, "--batch-events", "--input", str(EXAMPLES / "call.jsonl"))
     control(fleet, "session", "--client-type", "6", "--session-id", "43", "--client", "lamp", "--service", "hall",
             "--require-user-info", "--input", str(EXAMPLES / "lamp.jsonl"))
-    parent = subprocess.Popen([side.program("veltractl"), "--root", str(fleet.path / "root"), "session", "--client-type", "10",
-                               "--session-id", "1", "--aggregate", *FAMILY], stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
-    parent.stdout.readline()  # it has started
-    for number, kind in ((2, "8"), (3, "9")):
-        lines = [{"op": "send", "category": 5, "type": 10, "payload": {"round": at}} for at in range(2)]
-        control(fleet, "session", "--client-type", kind, "--session-id", str(number), *FAMILY,
-                input="".join(json.dumps(line) + "\n" for line in lines))
-    parent.communicate()
+    command = [side.program("veltractl"), "--root", str(fleet.path / "root"), "session", "--client-type", "10", "--session-id", "1",
+               "--aggregate", *FAMILY]
+    with subprocess.Popen(command, stdin=subprocess.PIPE, stdout=subprocess.PIPE, start_new_session=True, text=True) as parent:
+        try:
+            parent.stdout.readline()  # it has started
+            for number, kind in ((2, "8"), (3, "9")):
+                lines = [{"op": "send", "category": 5, "type": 10, "payload": {"round": at}} for at in range(2)]
+                control(fleet, "session", "--client-type", kind, "--session-id", str(number), *FAMILY,
+                        input="".join(json.dumps(line) + "\n" for line in lines))
+            parent.communicate()
+        finally:
+            parent.kill()
     report = fleet.path / "report.log"
     report.write_text("the call was fine\n" * 100)
     control(fleet, "upload", *PHONE, str(report))

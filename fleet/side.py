@@ -18,16 +18,71 @@ import urllib.request
 
 HERE = pathlib.Path(__file__).resolve().parent
 SOURCE = HERE.parent
-BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "release"))
+BUILD = pathlib.Path(os.environ.get("VELTRA_BUILD", SOURCE / "build" / "release")).resolve()
 STREAMS = ["stream1", "stream2", "stream3"]
 GATEWAYS = ["gateway1", "gateway2"]
 NAMES = ["nginx", *STREAMS, *GATEWAYS, "drain", "postgres", "daemon"]
 START_ORDER = ["postgres", *STREAMS, *GATEWAYS, "drain", "nginx", "daemon"]
+PROGRAMS = ["openssl", "initdb", "postgres", "psql", "pg_isready", "createdb", "nats-server", "nginx", "setpriv",
+            "veltrad", "veltractl", "veltra-storebag", "veltra-gateway"]
 DEADLINE = 60
+# Fields of stat().
+STATE, SESSION, BEGIN = 0, 3, 19
 
 
 class Missing(Exception):
     """A program is not installed."""
+
+
+class Ended(BaseException):
+    """Somebody has asked this program to end."""
+
+
+class Signals:
+    """Those that end a program. Once watched they are only noted; one of them raises Ended, once, where nothing is half done:
+    within free(), but not within whole()."""
+
+    def __init__(self):
+        self.came = self.raised = self.are_free = False
+
+    def watch(self):
+        for number in (signal.SIGINT, signal.SIGTERM, signal.SIGHUP):
+            if number != signal.SIGHUP or signal.getsignal(number) != signal.SIG_IGN:  # nohup ignores it
+                signal.signal(number, self.note)
+
+    def note(self, *_):
+        self.came = True
+        self.check()
+
+    def check(self):
+        if self.came and self.are_free and not self.raised:
+            self.raised = True
+            raise Ended
+
+    @contextlib.contextmanager
+    def free(self, free=True):
+        before, self.are_free = self.are_free, free
+        try:
+            self.check()
+            yield
+        finally:
+            self.are_free = before
+        self.check()
+
+    def whole(self):
+        return self.free(False)
+
+
+signals = Signals()
+
+
+def run(*command, **more):
+    """What a short program prints. It runs to its end whatever comes, also if Ctrl-C is pressed in its terminal."""
+    with signals.whole():
+        done = subprocess.run(command, capture_output=True, text=True, start_new_session=True, **more)
+    if done.returncode != 0:
+        raise AssertionError(f"{pathlib.Path(command[0]).name}: {done.stderr}{done.stdout}")
+    return done.stdout
 
 
 def program(name):
@@ -40,6 +95,12 @@ def program(name):
     if found := shutil.which(name):
         return found
     raise Missing(f"{name} is not installed; scripts/setup gateway installs what the fleet needs")
+
+
+def check_programs():
+    """Before anything starts."""
+    for name in PROGRAMS:
+        program(name)
 
 
 def wait_until(condition, what, deadline=DEADLINE):
@@ -69,11 +130,16 @@ def answers(url):
     return False
 
 
+def stat(pid):
+    """What the kernel says of a process, from its state on; nothing if there is none."""
+    with contextlib.suppress(OSError):
+        return pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()
+    return None
+
+
 def alive(pid):
-    try:
-        return pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()[0] != "Z"
-    except OSError:
-        return False
+    found = stat(pid)
+    return bool(found) and found[STATE] != "Z"
 
 
 def filled(name, values):
@@ -88,18 +154,24 @@ class Fleet:
         self.path, self.facts = pathlib.Path(path), facts
 
     @classmethod
-    def make(cls, **options):
-        """Makes the directory and everything that the parts read. Options: rate, maxAge, gateway and drain (further arguments)."""
-        path = pathlib.Path(tempfile.mkdtemp(prefix="veltra-fleet-"))
-        path.chmod(0o755)
-        https, postgres, admin, *ports = free_ports(3 + 3 * len(STREAMS) + 2 * len(GATEWAYS))
-        facts = {"dir": str(path), "pids": {}, "https": https, "postgres": postgres, "drain": admin,
+    def plan(cls, **options):
+        """With an empty directory. Options: rate, maxAge, gateway and drain (further arguments)."""
+        https, admin, *ports = free_ports(2 + 3 * len(STREAMS) + 2 * len(GATEWAYS))
+        facts = {"pids": {}, "begun": {}, "https": https, "drain": admin,
                  "dashboard": free_ports(1, socket.SOCK_DGRAM)[0], "options": options,
                  "streams": {name: ports[3 * at:3 * at + 3] for at, name in enumerate(STREAMS)},
                  "gateways": {name: ports[9 + 2 * at:11 + 2 * at] for at, name in enumerate(GATEWAYS)}}
-        fleet = cls(path, facts)
-        fleet.configure()
-        fleet.save()
+        return cls(tempfile.mkdtemp(prefix="veltra-fleet-"), facts)
+
+    @classmethod
+    def make(cls, **options):
+        """With all that the parts read."""
+        fleet = cls.plan(**options)
+        try:
+            fleet.configure()
+        except BaseException:
+            fleet.remove()
+            raise
         return fleet
 
     @classmethod
@@ -117,7 +189,7 @@ class Fleet:
 
     @property
     def dsn(self):
-        return f"host=127.0.0.1 port={self.facts['postgres']} user=veltra dbname=veltra"
+        return f"host={self.path}/postgres port=5432 user=veltra dbname=veltra"
 
     def line(self):
         """What those who use the fleet need, as one object."""
@@ -131,14 +203,16 @@ class Fleet:
     # What the parts read
 
     def configure(self):
+        """Makes everything that the parts read."""
+        self.path.chmod(0o755)
+        self.save()
         for name in ("tls", "nginx/www", "bags", "files", "logs", "postgres", *STREAMS):
             (self.path / name).mkdir(parents=True)
         for name in ("empty", "busy"):
             (self.path / "nginx/www" / name).touch()
-        subprocess.run([program("openssl"), "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes",
-                        "-keyout", "tls/key.pem", "-out", "tls/certificate.pem", "-days", "30", "-subj", "/CN=localhost",
-                        "-addext", "subjectAltName=DNS:localhost,IP:127.0.0.1"],
-                       cwd=self.path, check=True, capture_output=True)
+        run(program("openssl"), "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:P-256", "-nodes",
+            "-keyout", "tls/key.pem", "-out", "tls/certificate.pem", "-days", "30", "-subj", "/CN=localhost",
+            "-addext", "subjectAltName=DNS:localhost,IP:127.0.0.1", cwd=self.path)
         gateways = "\n".join(f"    server 127.0.0.1:{listen} max_fails=0;" for listen, _ in self.facts["gateways"].values())
         options = self.facts["options"]
         (self.path / "nginx/nginx.conf").write_text(filled("nginx.conf", {
@@ -158,14 +232,15 @@ class Fleet:
         return [program("setpriv"), "--reuid=postgres", "--regid=postgres", "--init-groups", *command]
 
     def make_database(self):
+        """Whoever can reach its socket is its superuser, so its folder is closed to others."""
         folder = self.path / "postgres"
+        folder.chmod(0o700)
         if os.getuid() == 0:
             os.chown(folder, pwd.getpwnam("postgres").pw_uid, pwd.getpwnam("postgres").pw_gid)
-        subprocess.run(self.as_postgres(program("initdb"), "-D", str(folder / "data"), "-U", "veltra", "--auth=trust",
-                                        "--encoding=UTF8", "--locale=C.UTF-8", "--no-instructions"),
-                       check=True, capture_output=True, cwd="/")
+        run(*self.as_postgres(program("initdb"), "-D", str(folder / "data"), "-U", "veltra", "--auth-local=trust",
+                              "--auth-host=reject", "--encoding=UTF8", "--locale=C.UTF-8", "--no-instructions"), cwd="/")
         with (folder / "data/postgresql.conf").open("a") as file:
-            file.write(filled("postgresql.conf", {"PORT": self.facts["postgres"], "DIR": self.path}))
+            file.write(filled("postgresql.conf", {"DIR": self.path}))
 
     def make_root(self):
         root = self.path / "root"
@@ -180,7 +255,7 @@ class Fleet:
         write("var/lib/veltrad/preferences/com.florn.veltra.plist",
               {"veltra_storebag_url": self.url + "/bags/maple", "environmentType": 4, "DiagnosticLogSubmissionEnabled": True})
         keys = self.path / "keys"
-        subprocess.run([program("veltra-storebag"), "keygen", str(keys)], check=True, capture_output=True)
+        run(program("veltra-storebag"), "keygen", str(keys))
         write("usr/share/veltra/publicKey.der", (keys / "publicKey.der").read_bytes())
 
     def publish(self, name, text):
@@ -188,11 +263,11 @@ class Fleet:
         text = text.replace('"${dashboardPort}"', str(self.facts["dashboard"])).replace("${url}", self.url)
         source = self.path / f"{name}.json"
         source.write_text(text)
-        for command in (["sign", "--key", "keys/private.pem", str(source), "-o", name],
-                        ["publish", "--key", "keys/publicKey.der", name, "bags"]):
-            done = subprocess.run([program("veltra-storebag"), *command], cwd=self.path, capture_output=True, text=True)
-            if done.returncode != 0:
-                raise AssertionError(done.stdout + done.stderr)
+        self.storebag("sign", "--key", "keys/private.pem", str(source), "-o", name)
+        self.storebag("publish", "--key", "keys/publicKey.der", name, "bags")
+
+    def storebag(self, *arguments):
+        run(program("veltra-storebag"), *arguments, cwd=self.path)
 
     # The parts
 
@@ -217,12 +292,30 @@ class Fleet:
         environment = {key: value for key, value in os.environ.items() if not key.startswith("VELTRA_") and key != "NOTIFY_SOCKET"}
         if name == "daemon":
             environment.update(VELTRA_ROOT=str(self.path / "root"), VELTRA_LOG_TARGET="stderr", LANG="en_US.UTF-8")
-        with (self.path / "logs" / f"{name}.log").open("ab") as log:
-            started = subprocess.Popen(self.command(name), stdin=subprocess.DEVNULL, stdout=log, stderr=log, cwd="/",
+        command = self.command(name)
+        with signals.whole(), (self.path / "logs" / f"{name}.log").open("ab") as log:
+            self.end(name)
+            started = subprocess.Popen(command, stdin=subprocess.DEVNULL, stdout=log, stderr=log, cwd="/",
                                        env=environment, start_new_session=True)
-        self.facts["pids"][name] = started.pid
-        self.save()
+            self.facts["pids"][name], self.facts["begun"][name] = started.pid, stat(started.pid)[BEGIN]
+            self.save()
         return started
+
+    def runs(self, name):
+        """False also if the number of its process belongs to another one by now."""
+        found = stat(self.facts["pids"].get(name, -1))
+        return bool(found) and found[STATE] != "Z" and found[BEGIN] == self.facts["begun"][name]
+
+    def end(self, name):
+        """Kills the part with all processes that it has begun, which may have outlived it."""
+        pid = self.facts["pids"].get(name, -1)
+        if alive(pid) and not self.runs(name):
+            return
+        for one in filter(str.isdigit, os.listdir("/proc")):
+            found = stat(one)
+            if found and found[SESSION] == str(pid):
+                with contextlib.suppress(ProcessLookupError):
+                    os.kill(int(one), signal.SIGKILL)
 
     def is_ready(self, name):
         if name == "nginx":
@@ -234,7 +327,7 @@ class Fleet:
         if name == "drain":
             return answers(f"http://127.0.0.1:{self.facts['drain']}/ready")
         if name == "postgres":
-            return subprocess.run([program("pg_isready"), "-q", "-d", self.dsn], capture_output=True).returncode == 0
+            return subprocess.run([program("pg_isready"), "-q", "-d", self.dsn], start_new_session=True).returncode == 0
         return (self.path / "root/run/veltrad/com.florn.veltrad.sock").exists()
 
     def start(self, names):
@@ -243,18 +336,18 @@ class Fleet:
 
         def ready(name):
             child = children.get(name)
-            if child and child.poll() is not None or not alive(self.facts["pids"].get(name, -1)):
+            if child and child.poll() is not None or not self.runs(name):
                 # Also what a killed server has left may have to end first.
                 children[name] = self.begin(name)
                 time.sleep(0.1)
             return self.is_ready(name)
         names = [name for name in START_ORDER if name in names]
-        if "daemon" in names and not alive(self.facts["pids"].get("daemon", -1)):
+        if "daemon" in names and not self.runs("daemon"):
             (self.path / "root/run/veltrad/com.florn.veltrad.sock").unlink(missing_ok=True)
         # The servers of the stream wait for each other.
         for group in ([n for n in names if n == "postgres" or n in STREAMS], [n for n in names if n not in ("postgres", *STREAMS)]):
             for name in group:
-                if not alive(self.facts["pids"].get(name, -1)):
+                if not self.runs(name):
                     children[name] = self.begin(name)
             for name in group:
                 wait_until(lambda: ready(name), f"{name} is ready; its log is {self.path}/logs/{name}.log")
@@ -263,22 +356,18 @@ class Fleet:
         return children
 
     def make_tables(self):
-        known = subprocess.run([program("psql"), "-Atqc", "SELECT 1 FROM pg_database WHERE datname = 'veltra'",
-                                self.dsn.replace("dbname=veltra", "dbname=postgres")], capture_output=True, text=True)
-        if known.stdout.strip() != "1":
-            subprocess.run([program("createdb"), "-h", "127.0.0.1", "-p", str(self.facts["postgres"]), "-U", "veltra", "veltra"],
-                           check=True, capture_output=True)
+        server = self.dsn.replace("dbname=veltra", "dbname=postgres")
+        if not run(program("psql"), "-AtqXc", "SELECT 1 FROM pg_database WHERE datname = 'veltra'", server).strip():
+            run(program("createdb"), "--maintenance-db", server, "veltra")
 
     def query(self, sql):
         """The rows of a query, as lists of texts."""
-        done = subprocess.run([program("psql"), "-AtqX", "-F", "\x1f", "-c", sql, self.dsn], capture_output=True, text=True)
-        if done.returncode != 0:
-            raise AssertionError(done.stderr)
-        return [line.split("\x1f") for line in done.stdout.split("\n")[:-1]]
+        rows = run(program("psql"), "-AtqX", "-F", "\x1f", "-c", sql, self.dsn)
+        return [line.split("\x1f") for line in rows.split("\n")[:-1]]
 
     def table(self, sql):
         """The same as psql shows it."""
-        return subprocess.run([program("psql"), "-qX", "-c", sql, self.dsn], capture_output=True, text=True).stdout
+        return run(program("psql"), "-qX", "-c", sql, self.dsn)
 
     def is_carried(self):
         """Whether the tables hold everything that the stream has taken."""
@@ -292,23 +381,22 @@ class Fleet:
 
     def kill(self, name, number=signal.SIGKILL):
         with contextlib.suppress(ProcessLookupError):
-            os.kill(self.facts["pids"][name], number)
+            if self.runs(name):
+                os.kill(self.facts["pids"][name], number)
 
     def stop(self):
         """Ends every part, those first that send to the others."""
-        self.facts = Fleet.at(self.path).facts
         for name in reversed(START_ORDER):
-            pid = self.facts["pids"].get(name)
-            if not pid or not alive(pid):
-                continue
+            with contextlib.suppress(FileNotFoundError):
+                self.facts = Fleet.at(self.path).facts  # another process may have brought it back
             self.kill(name, signal.SIGINT if name == "postgres" else signal.SIGTERM)
             with contextlib.suppress(AssertionError):
-                wait_until(lambda: not alive(pid), f"{name} ends", 20)
-            if alive(pid):
-                self.kill(name)
+                wait_until(lambda: not self.runs(name), f"{name} ends", 20)
+            self.end(name)
 
     def remove(self):
-        shutil.rmtree(self.path, ignore_errors=True)
+        """What a killed server has left may still write for a moment."""
+        wait_until(lambda: shutil.rmtree(self.path, ignore_errors=True) or not self.path.exists(), f"{self.path} is gone", 10)
 
 
 def connects(port):

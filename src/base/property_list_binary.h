@@ -39,7 +39,9 @@ inline constexpr double kSecondsFrom1970To2001 = 978'307'200;
 // `size` is 1 to 8.
 inline std::uint64_t bigEndian(const char* at, std::size_t size) {
   std::uint64_t number = static_cast<std::uint8_t>(at[0]);
-  if (size == 1) return number;  // the most frequent case
+  // Nearly all references have 1 byte, and nearly all offsets 1 or 2.
+  if (size == 1) return number;
+  if (size == 2) return number << 8 | static_cast<std::uint8_t>(at[1]);
   if (size == 8) {
     std::memcpy(&number, at, 8);
     return be64toh(number);

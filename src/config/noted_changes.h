@@ -24,8 +24,10 @@ class NotedChanges final : public FieldChanges {
     note(change == FieldChange::removed ? wire::Step::removed : wire::Step::hashed, name);
   }
   void restored(std::string_view name) { note(wire::Step::restored, name); }
-  void changed(const EditedFields& edits) {
-    for (const std::string& name : edits.removed) note(wire::Step::removed, name);
+  // Without the removed ones that stay hashed elsewhere in the message; null: nowhere.
+  void changed(const EditedFields& edits, const EditedFields* elsewhere = nullptr) {
+    for (const std::string& name : edits.removed)
+      if (!elsewhere || !elsewhere->hashed.contains(name)) note(wire::Step::removed, name);
     for (const std::string& name : edits.hashed) note(wire::Step::hashed, name);
   }
 

@@ -2,6 +2,8 @@
 // The keys of settings.json, and which of its contents holds. Any thread.
 #include "config/operator_settings.h"
 
+#include <fmt/format.h>
+
 #include <utility>
 
 #include "config/settings_check.h"
@@ -169,8 +171,15 @@ std::shared_ptr<const OperatorChoices> choicesIn(const platform::LocalContent& c
   if (content.warning) found.warnings.insert(found.warnings.begin(), *content.warning);
   for (const std::string& warning : found.warnings) lines.warnings.push_back("Settings: " + warning);
   if (content.kind == Kind::absent) return std::make_shared<const OperatorChoices>();
-  if (!found.error)
-    return std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*content.value.asDictionary()));
+  if (!found.error) {
+    auto choices =
+        std::make_shared<const OperatorChoices>(parsed<OperatorChoices>(*content.value.asDictionary()));
+    if (const std::size_t keys = choices->keys.texts.size(); keys > kMostFurtherKeys)
+      lines.warnings.push_back(
+          fmt::format("Settings: {}: \"keys\" names {} files, of which the first {} are used",
+                      content.placeOf({"keys"}), keys, kMostFurtherKeys));
+    return choices;
+  }
   const char* meanwhile = before ? "the last ones stand: " : "no storebag is accepted: ";
   lines.errors.push_back(std::string("Settings could not be read, ") + meanwhile + *found.error);
   return before;

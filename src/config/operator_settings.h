@@ -3,6 +3,7 @@
 // changed.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -61,6 +62,9 @@ struct SpoolChoices {
 };
 void take(const Key& key, const Value& value, std::optional<SpoolChoices>& field);
 
+// Of "keys"; those beyond are not read.
+inline constexpr std::size_t kMostFurtherKeys = 16;
+
 // How a back end comes by its sampling factor.
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
@@ -80,7 +84,8 @@ struct OperatorChoices {
 };
 
 // A file that is broken, unreadable or holds a value of a wrong type or out of its range is one error line a
-// change, and the last good content stands. A key that is unknown or has no effect is one warning a change.
+// change, and the last good content stands. A key that is unknown or has no effect, and further ones of
+// "keys", are one warning a change.
 class OperatorSettings final : public SettingsFollower<OperatorChoices> {
  public:
   // `path`: of either form. What holds is null while the file has never been good, or could not be read yet.

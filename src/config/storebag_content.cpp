@@ -45,10 +45,10 @@ constexpr auto kUploadKeys = keysOf<UploadProfile>({
         {"display_url", text, kUnbounded, optional, "none", "Address that clients may show to their user."}),
 });
 
-// The daemon does not read this entry.
-constexpr std::array<Key, 1> kAdaptorKeys{Key{"active", presence, kUnbounded, optional, "nothing",
-                                              "Marks the entry for the reader; it has no effect."}};
-constexpr KeyTable kAdaptorTable{kAdaptorKeys};
+// The daemon does not read these entries.
+constexpr std::array<Key, 1> kMarkKeys{Key{"active", presence, kUnbounded, optional, "nothing",
+                                           "Marks the entry for the reader; it has no effect."}};
+constexpr KeyTable kMarkTable{kMarkKeys};
 
 template <typename Parsed>
 constexpr Row<StorebagSection> profile(const char* name, const char* meaning) {
@@ -69,9 +69,9 @@ constexpr auto kSectionKeys = keysOf<StorebagSection>({
     profile<HTTPSPostProfile>(wire::kVeltraBackendHTTPPost, "Posts messages as JSON events."),
     profile<HTTPSPostProfile>(wire::kVeltraBackendHTTPPost2, "Posts messages to a second collector."),
     {{wire::kVeltraBackendAmpery, dictionary, kUnbounded, optional, "no such back end",
-      "Writes messages to the energy log."}},
+      "Writes messages to the energy log.", &kMarkTable}},
     {{wire::kVeltraBackendMivo, dictionary, kUnbounded, optional, "no such back end",
-      "Hands messages to the adaptor bundle.", &kAdaptorTable}},
+      "Hands messages to the adaptor bundle.", &kMarkTable}},
 });
 
 constexpr auto kStorebagKeys = keysOf<Storebag>({

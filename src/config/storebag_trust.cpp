@@ -22,7 +22,6 @@ using Cause = StorebagCause;
 
 constexpr std::size_t kMostKeyBytes = 1u << 16;
 // Each may cost a verification of every storebag.
-constexpr std::size_t kMostKeys = 16;
 
 bool isFileName(const std::string& text) {
   return !text.empty() && text != "." && text != ".." && text.find('/') == std::string::npos &&
@@ -90,7 +89,7 @@ Result<Dictionary, StorebagTrust::Refusal> StorebagTrust::accepted(const std::st
 
 Result<StorebagTrust::Keys, StorebagTrust::Refusal> StorebagTrust::keys(const OperatorChoices& choices) {
   Keys keys;
-  for (std::size_t i = 0; i < choices.keys.texts.size() && i < kMostKeys; ++i) {
+  for (std::size_t i = 0; i < choices.keys.texts.size() && i < kMostFurtherKeys; ++i) {
     if (auto shortage = addFurtherKey(choices.keys.texts[i], keys)) return Failure{std::move(*shortage)};
   }
   const auto without = addPublicKey(keys);

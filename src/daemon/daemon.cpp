@@ -60,17 +60,26 @@ Daemon::Daemon(Services& services)
       _privacy(services, _agent, _factory, _library, spool()) {}
 
 void Daemon::startSpool() {
-  if (_spool) {
-    if (const auto made = _spool->folder().make(); !made)
-      logError("The spool's directory cannot be made: %s", made.error().c_str());
-    _spoolSender.emplace(*_spool, _services.http);
-    if (!_spoolSender->start(_agent.storebags()))
-      logError("The spool's thread cannot be started, and nothing of it is sent");
-    return;
-  }
-  // What the settings say is not known while they cannot be read.
+  if (_spoolIsStarted) return;
+  const std::string trouble = _spool ? runSpool() : removeSpool();
+  _spoolIsStarted = trouble.empty();
+  if (trouble == _spoolTrouble) return;
+  if (!trouble.empty()) logError("The spool is started again later: %s", trouble.c_str());
+  if (trouble.empty()) logInfo("The spool is started");
+  _spoolTrouble = trouble;
+}
+
+std::string Daemon::runSpool() {
+  const auto made = _spool->folder().make();
+  if (!_spoolSender) _spoolSender.emplace(*_spool, _services.http, _agent.storebags());
+  if (!_spoolSender->start()) return "there is no thread or descriptor for it";
+  return made ? std::string() : made.error();
+}
+
+// What the settings say is not known while they cannot be read.
+std::string Daemon::removeSpool() {
   const auto choices = _choices.current();
-  if (!choices || choices->spool) return;
+  if (!choices || choices->spool) return {};
   const support::SpoolFolder folder(_services.files, _services.root.spoolDirectory());
   const auto removed = folder.removeAll();
   _services.counters.eventTaken(removed.events);
@@ -79,6 +88,7 @@ void Daemon::startSpool() {
   if (removed.posts + removed.torn > 0)
     logWarning("There is no \"spool\" in the settings: %llu kept posts are removed",
                static_cast<unsigned long long>(removed.posts + removed.torn));
+  return removed.all ? std::string() : "files of an earlier one cannot be removed";
 }
 
 void Daemon::stopSpool() {

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <optional>
+#include <string>
 
 #include "backends/backend_factory.h"
 #include "backends/https/post_spool.h"
@@ -27,7 +28,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 19 fields are these objects, in the order in which they need each other, whatever the padding.
+// 21 fields are these objects, in the order in which they need each other, whatever the padding.
 // NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding)
 class Daemon {
  public:
@@ -44,12 +45,16 @@ class Daemon {
   // Null: posts that fail are lost.
   backends::PostSpool* spool() { return _spool ? &*_spool : nullptr; }
   // Sends what an earlier daemon has kept, and what this one keeps, or removes it where the operator wants no
-  // spool any more.
+  // spool any more. Called again each second, because it may find the daemon short of something.
   void startSpool();
   // From now on nothing of the spool is sent.
   void stopSpool();
 
  private:
+  // Why it has to be started again; empty: it has not.
+  std::string runSpool();
+  std::string removeSpool();
+
   Services& _services;
   support::Veltra _library;
   support::DeviceIdentity _device;
@@ -69,6 +74,8 @@ class Daemon {
   StorebagFollower _follower;
   Privacy _privacy;
   std::optional<backends::SpoolSender> _spoolSender;
+  bool _spoolIsStarted = false;
+  std::string _spoolTrouble;  // that was logged last
 };
 
 }  // namespace veltrad::daemon

@@ -189,6 +189,7 @@ void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& li
     if (++ownerTicks < kOwnerTicks) return;
     ownerTicks = 0;
     daemon.follower().tick();
+    daemon.startSpool();
     services.allowance.load();
     services.destinations.load();
     files.counters.writeSoon();
@@ -310,6 +311,7 @@ int main(int count, char** arguments) {
                                   services.root.metricsPath());
   daemon.startSpool();
   if (!listener.resume() || !control.resume()) {
+    services.http.failBlockingWaits();
     daemon.stopSpool();
     services.http.drain(std::chrono::steady_clock::now());
     return 1;

@@ -153,7 +153,8 @@ Observers::Answer Observers::status(const Dictionary&) {
 
 Observers::Answer Observers::sessions(const Dictionary& arguments) {
   const Value* after = arguments.find("after");
-  return statusOfSessions(_agent, static_cast<std::uint64_t>(after ? after->toInt64().value_or(0) : 0));
+  return statusOfSessions(_agent, *_services.gate.word(),
+                          static_cast<std::uint64_t>(after ? after->toInt64().value_or(0) : 0));
 }
 
 Observers::Answer Observers::metrics(const Dictionary&) {

@@ -15,6 +15,7 @@
 #include "base/text.h"
 #include "base/version.h"
 #include "config/client_types.h"
+#include "config/owner_gate.h"
 #include "daemon/veltrad_agent.h"
 #include "http/server_records.h"
 #include "wire/constants.h"
@@ -61,10 +62,13 @@ Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
           {"lastOutcome", activity.lastOutcome.empty() ? Value(kNotKnown) : Value(activity.lastOutcome)}};
 }
 
-Dictionary statusOfSession(const ListedSession& listed) {
+Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord& word) {
   const session::FamilyFacts& facts = listed.facts;
   const Dictionary* info = facts.sessionInfo.get();
-  const Dictionary* user = facts.userInfo.get();
+  // The session itself may not have heard the word yet.
+  Dictionary user = facts.userInfo ? *facts.userInfo : Dictionary();
+  config::EditedFields edits;
+  if (word.fields) word.fields->apply(user, edits);
   const auto clientType = info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
   Array backends;
   if (facts.backends) {
@@ -73,8 +77,8 @@ Dictionary statusOfSession(const ListedSession& listed) {
   return {{"id", listed.number},
           {"clientType", clientType ? Value(*clientType) : Value(kNotKnown)},
           {"sessionID", facts.sessionID},
-          {"clientName", textOrNull(user ? user->string(wire::kVeltraUserInfoClientName) : nullptr)},
-          {"serviceName", textOrNull(user ? user->string(wire::kVeltraUserInfoServiceName) : nullptr)},
+          {"clientName", textOrNull(user.string(wire::kVeltraUserInfoClientName))},
+          {"serviceName", textOrNull(user.string(wire::kVeltraUserInfoServiceName))},
           {"backends", std::move(backends)}};
 }
 
@@ -138,7 +142,7 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers) {
   return all;
 }
 
-Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after) {
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after) {
   // With five back ends each and long names, so many sessions stay below a frame's bounds.
   constexpr std::size_t kMost = 200;
   const auto all = agent.sessions();
@@ -153,7 +157,7 @@ Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after) {
       more = true;
       break;
     }
-    Dictionary status = statusOfSession(listed);
+    Dictionary status = statusOfSession(listed, word);
     const auto parent = parents.find(listed.facts.aggregation.get());
     const auto number = parent == parents.end() ? numbers.end() : numbers.find(parent->second);
     if (number != numbers.end()) status.set("parent", number->second);

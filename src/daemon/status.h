@@ -8,6 +8,10 @@
 
 #include "base/value.h"
 
+namespace veltrad::config {
+struct OwnersWord;
+}  // namespace veltrad::config
+
 namespace veltrad::http {
 struct ServerRecord;
 }  // namespace veltrad::http
@@ -51,7 +55,7 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers);
 // {"sessions": [{"id", "parent", "clientType", "sessionID", "clientName", "serviceName", "backends":
 // [{"name", "state", "reason": {"name", "text"}, "held", "underWay", "lastOutcome"}]}], "more": true where
 // there are others}. "id" is the number, "parent" that of the parent session, if there is one. Of a name, the
-// first 256 bytes.
-Dictionary statusOfSessions(VeltradAgent& agent, std::uint64_t after);
+// first 256 bytes; names that the owner keeps back stay back.
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after);
 
 }  // namespace veltrad::daemon

@@ -8,7 +8,7 @@
 #include <optional>
 #include <string>
 
-#include "backends/https/spool_rules.h"
+#include "backends/https/spool_sections.h"
 #include "config/storebag_content.h"
 #include "config/storebag_source.h"
 #include "daemon/lock_ranks.h"

@@ -276,7 +276,8 @@ HTTPResult CurlTransfer::result(CURLcode code) {
   curl_easy_getinfo(_easy, CURLINFO_RESPONSE_CODE, &status);
   const bool statusCounts = code == CURLE_OK || (answerTooLarge() && !_request.keepsAnswer);
   if (statusCounts)
-    return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body), retryAfter()};
+    return HTTPResponse{static_cast<int>(status), std::move(_headers), std::move(_body), retryAfter(),
+                        _attempts};
   HTTPError error{kindOf(code), {}, static_cast<int>(status), causeOf(code)};
   error.retryAfter = retryAfter();
   try {

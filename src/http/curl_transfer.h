@@ -38,6 +38,7 @@ class CurlTransfer {
   // 0: it was not recorded.
   std::uint64_t record() const { return _record; }
   bool hasBegun() const { return _begun; }
+  int transmissions() const { return _attempts; }
   // True at the first call.
   bool beginsFirst() { return !std::exchange(_begun, true); }
   // Its sender keeps and records it.

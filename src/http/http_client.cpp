@@ -270,6 +270,7 @@ void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
     if (!result) {
       HTTPError error = result.error();
       error.begun = one.front().hasBegun();
+      error.transmissions = one.front().transmissions();
       result = Failure{std::move(error)};
     }
     record(one.front().host(), result);

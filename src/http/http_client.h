@@ -82,6 +82,9 @@ struct HTTPResponse {
   std::string body;
   // What "Retry-After" asks for, at most a day; 0: nothing.
   std::chrono::seconds retryAfter{0};
+  // How often the request went out. libcurl repeats one that a kept connection ends without an answer, if it
+  // is kept by its sender.
+  int transmissions = 0;
 
   // The first value under this name, letter case ignored.
   std::optional<std::string_view> header(std::string_view name) const;
@@ -107,6 +110,7 @@ struct HTTPError {
   bool begun = false;
   // As in HTTPResponse, of an incomplete answer.
   std::chrono::seconds retryAfter{0};
+  int transmissions = 0;
 
   // False: nothing of the request has left the device.
   bool mayHaveArrived() const {

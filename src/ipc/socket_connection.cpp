@@ -30,6 +30,9 @@ constexpr std::chrono::seconds kLastWrites{1};
 constexpr std::chrono::seconds kLongestWaitForFrames{2};
 // Bounds the time for which answers wait for those of calls that came with theirs.
 constexpr std::size_t kMostHeldBytes = 4096;
+// In milliseconds.
+constexpr int kNewsAgain = 1000;
+constexpr int kWithoutEnd = -1;
 
 }  // namespace
 
@@ -68,7 +71,7 @@ void SocketConnection::nudge() {
   _out->wakeReader();
 }
 
-// Without memory it is tried again before the next call.
+// Without memory it is tried again before the next call, and within kNewsAgain.
 void SocketConnection::takeNews() {
   if (!_nudged.load(std::memory_order_relaxed) || !_session) return;
   _nudged.exchange(false, std::memory_order_acquire);
@@ -190,7 +193,8 @@ void SocketConnection::waitForClientToRead() {
 // Waits until the client has sent something, for room to write what waits, or for a wake-up.
 void SocketConnection::waitForBytes() {
   _reader.rest();
-  poll(_out->flush() > 0 ? POLLIN | POLLOUT : POLLIN);
+  const bool newsWait = _nudged.load(std::memory_order_relaxed);
+  poll(_out->flush() > 0 ? POLLIN | POLLOUT : POLLIN, newsWait ? kNewsAgain : kWithoutEnd);
 }
 
 void SocketConnection::poll(short events, int milliseconds) {

@@ -26,9 +26,12 @@ std::chrono::nanoseconds sleptSoFar() {
 
 }  // namespace
 
-WakeWatch::WakeWatch()
-    : _routes(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC | SOCK_NONBLOCK, NETLINK_ROUTE)),
-      _slept(sleptSoFar()) {
+WakeWatch::WakeWatch() : _slept(sleptSoFar()) {
+  open();
+}
+
+void WakeWatch::open() {
+  _routes.reset(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC | SOCK_NONBLOCK, NETLINK_ROUTE));
   sockaddr_nl address{};
   address.nl_family = AF_NETLINK;
   address.nl_groups = RTMGRP_IPV4_ROUTE | RTMGRP_IPV6_ROUTE;
@@ -41,6 +44,7 @@ bool WakeWatch::happened() {
   const auto slept = sleptSoFar();
   const bool woke = slept - _slept > std::chrono::seconds(1);
   _slept = slept;
+  if (!_routes.isOpen()) open();
   return routeCame() || woke;
 }
 

@@ -12,7 +12,7 @@ namespace veltrad::platform {
 
 class WakeWatch {
  public:
-  // Without a netlink socket only waking is noticed.
+  // While there is no netlink socket, only waking is noticed.
   WakeWatch();
 
   // To be polled for reading; negative: there is none.
@@ -21,6 +21,7 @@ class WakeWatch {
   bool happened();
 
  private:
+  void open();
   bool routeCame();
 
   FileDescriptor _routes;

@@ -3,6 +3,7 @@
 #include "platform/watched_contents.h"
 
 #include <algorithm>
+#include <new>
 
 #include "base/property_list.h"
 
@@ -30,6 +31,14 @@ void WatchedContents::leaves() {
   std::deque<Piece>().swap(_pieces);
 }
 
+void WatchedContents::tryToPut(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo) {
+  try {
+    put(message, payload, userInfo);
+  } catch (const std::bad_alloc&) {
+    // The message itself goes on.
+  }
+}
+
 void WatchedContents::put(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo) {
   Dictionary contents;
   if (payload) contents.set("payload", *payload);
@@ -38,8 +47,8 @@ void WatchedContents::put(std::uint64_t message, const Dictionary* payload, cons
   if (piece.contents.size() > kMostOfOne) std::string().swap(piece.contents);
   const Lock held(_mutex);
   if (_watching.load(std::memory_order_relaxed) == 0) return;
-  _bytes += sizeOf(piece);
   _pieces.push_back(std::move(piece));
+  _bytes += sizeOf(_pieces.back());
   for (; _bytes > kMostBytes; ++_first) {
     _bytes -= sizeOf(_pieces.front());
     _pieces.pop_front();

@@ -37,9 +37,10 @@ class WatchedContents {
   std::unique_ptr<Watch> watch();
 
   // Called before readers learn of the message. Without anybody who watches it costs a comparison. Either may
-  // be null. Nothing in it may be what the owner of the device keeps back.
+  // be null. Nothing in it may be what the owner of the device keeps back. For want of memory nothing is
+  // kept, and readers count the message among those whose contents are lost.
   void keep(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo) {
-    if (_watching.load(std::memory_order_relaxed) > 0) put(message, payload, userInfo);
+    if (_watching.load(std::memory_order_relaxed) > 0) tryToPut(message, payload, userInfo);
   }
 
   struct Piece {
@@ -56,6 +57,7 @@ class WatchedContents {
   std::uint64_t next() const;
 
  private:
+  void tryToPut(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo);
   void put(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo);
   void leaves();
 

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -19,9 +20,10 @@ class GivenStorebag {
     _section = std::move(section);
     _version = std::move(version);
   }
-  // Gives what the daemon holds now. True if back ends must be made anew: another version, another section,
-  // or none that may be used, which leaves an empty one. This is logged with the session's ID.
-  bool follow(StorebagNow now, std::uint32_t sessionID);
+  // Gives what the daemon holds now. If back ends must be made anew, because of another version, another
+  // section, or none that may be used, which leaves an empty one, `make` makes them, and this is logged with
+  // the session's ID. What `make` throws leaves what was given before, so that the next call tries again.
+  void follow(StorebagNow now, std::uint32_t sessionID, const std::function<void()>& make);
   void forget() { give(nullptr, std::nullopt); }
 
   // Something was given.
@@ -29,6 +31,9 @@ class GivenStorebag {
   const std::optional<std::string>& version() const { return _version; }
 
  private:
+  // Whether it is another one.
+  bool take(StorebagNow now);
+
   std::shared_ptr<const config::StorebagSection> _section;
   std::optional<std::string> _version;
 };

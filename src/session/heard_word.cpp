@@ -2,16 +2,22 @@
 // Takes fields out as the owner's word asks. The session's thread.
 #include "session/heard_word.h"
 
+#include <utility>
+
 namespace veltrad::session {
 
-bool HeardWord::hear() {
-  const std::uint64_t turn = _gate.turn();
-  if (turn == _heard) return false;
-  auto word = _gate.word();
-  _reset = word->resets != _word->resets;
-  _heard = turn;
-  _word = std::move(word);
-  return true;
+void HeardWord::hear(const std::function<void()>& obey) {
+  for (std::uint64_t turn = _gate.turn(); turn != _heard; turn = _gate.turn()) {
+    auto before = std::exchange(_word, _gate.word());
+    _reset = _word->resets != before->resets;
+    try {
+      obey();
+    } catch (...) {
+      _word = std::move(before);
+      throw;
+    }
+    _heard = turn;
+  }
 }
 
 void HeardWord::takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41],

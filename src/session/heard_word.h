@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 
@@ -17,8 +18,9 @@ class HeardWord {
   // The gate outlives it.
   explicit HeardWord(const config::OwnerGate& gate) : _gate(gate) {}
 
-  // True if there is another word than before, which is heard now.
-  bool hear();
+  // Hears the word while there is another one than before, and has it obeyed. What `obey` throws leaves the
+  // word unheard, so that it is heard at the next call.
+  void hear(const std::function<void()>& obey);
   const config::OwnersWord& now() const { return *_word; }
   // If the word that was heard last came with other identifiers than the one before, reads the device's anew
   // and has the back ends read theirs. These read consent again if the policy asks for it at any time. `set`

@@ -10,6 +10,13 @@
 
 namespace veltrad::session {
 
+Message messageOf(Dictionary given) {
+  const std::uint16_t category = given.uint16(wire::kVeltraMessageParametersCategory).value_or(0);
+  const std::uint16_t type = given.uint16(wire::kVeltraMessageParametersType).value_or(0);
+  const std::int32_t flag = given.int32(wire::kVeltraMessageParametersFlag).value_or(0);
+  return {given.takeDictionary(wire::kVeltraMessageParametersPayload), {}, category, type, flag};
+}
+
 CopySent sendCopy(const CopySender& sender, std::int32_t hierarchy, const Message& message) {
   const FamilyPlace place{sender.aggregation, sender.userInfo.given, hierarchy};
   // A root has no ancestors, so it does not need the families' lock.

@@ -25,6 +25,9 @@ struct Message {
   backends::MessageNote note = {};
 };
 
+// As a client gives it. What is missing of category, type and flag is 0.
+Message messageOf(Dictionary given);
+
 // Who sends a copy.
 struct CopySender {
   VeltradSessionDelegate& delegate;

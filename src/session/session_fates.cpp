@@ -53,7 +53,7 @@ void SessionFates::describe(const FamilyFacts& facts, From from) {
 }
 
 void SessionFates::taken(Message& message, From from, const config::EditedFields* edits,
-                         std::optional<wire::Reason> reason) {
+                         std::optional<wire::Reason> reason, const std::string& copyTo) {
   message.note.edits = edits;
   if (!_pen.writes()) return;
   wire::MessageEntry entry;
@@ -67,13 +67,19 @@ void SessionFates::taken(Message& message, From from, const config::EditedFields
   if (reason) entry.reason = static_cast<std::uint8_t>(*reason);
   if (reason == wire::Reason::no_category) entry.known = 0;
   if (reason == wire::Reason::no_type) entry.known = wire::MessageEntry::categoryKnown;
+  if (!copyTo.empty()) entry.aggregatedTo = _pen.textOf(copyTo);
   _pen.ring()->contents().keep(entry.message, message.payload ? &*message.payload : nullptr,
                                _sentUserInfo.get());
   _pen.ring()->write(entry);
   message.note.number = entry.message;
   message.note.session = entry.session;
-  if (!edits || edits->empty()) return;
-  config::NotedChanges(_pen, {.time = entry.time, .message = entry.message}).changed(*edits);
+  if (edits && !edits->empty())
+    config::NotedChanges(_pen, {.time = entry.time, .message = entry.message}).changed(*edits);
+  if (entry.aggregatedTo == 0) return;
+  wire::StepEntry step;
+  step.message = entry.message;
+  step.text = entry.aggregatedTo;
+  _pen.write(wire::Step::aggregated, std::nullopt, step);
 }
 
 void SessionFates::refused(const FamilyFacts& facts, Message message, From from, wire::Reason why) {
@@ -91,14 +97,6 @@ backends::MessageNote SessionFates::taken(Item item) {
   entry.time = _pen.ring()->now();
   _pen.ring()->write(entry);
   return {nullptr, entry.message, entry.session};
-}
-
-void SessionFates::aggregated(const Message& message, const std::string& to) const {
-  if (!_pen.writes()) return;
-  wire::StepEntry step;
-  step.message = message.note.number;
-  step.text = _pen.textOf(to);
-  _pen.write(wire::Step::aggregated, std::nullopt, step);
 }
 
 }  // namespace veltrad::session

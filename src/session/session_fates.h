@@ -39,14 +39,13 @@ class SessionFates {
 
   // Sets the message's note; `edits` is what the owner keeps back of its payload, which the payload no longer
   // holds. Without `edits` it reached no back end, for `reason`. The time of a message that has none is now.
+  // `copyTo`: the session whose client got a copy; empty: none.
   void taken(Message& message, From from, const config::EditedFields* edits,
-             std::optional<wire::Reason> reason = std::nullopt);
+             std::optional<wire::Reason> reason = std::nullopt, const std::string& copyTo = {});
   // It reached no back end.
   void refused(const FamilyFacts& facts, Message message, From from, wire::Reason why);
   // A file or log data.
   backends::MessageNote taken(Item item);
-  // `to`: the session whose client gets a copy.
-  void aggregated(const Message& message, const std::string& to) const;
 
  private:
   const platform::FatePen _pen;

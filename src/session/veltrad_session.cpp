@@ -92,14 +92,14 @@ void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
 }
 
 void VeltradSession::hearOwner() {
-  while (_word.hear()) {
+  _word.hear([this] {
     _fates.forget();
     _word.takeIdentity(_services.device, _deviceid, _backends.get());
     _userInfo = _word.allowed(_userInfo.given);
-    if (!_backends) continue;
+    if (!_backends) return;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
     _leftFamily ? forbidByWord(*_backends, _word.now()) : updateSessionWithDefaultSessionInfo();
-  }
+  });
 }
 
 void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completionHandler) {
@@ -124,9 +124,11 @@ void VeltradSession::startConfigWithCompletionHandler(wire::NamesReply completio
 void VeltradSession::takeNews() {
   hearOwner();
   auto now = _backends ? _sessionDelegate.storebagNow(*this) : std::nullopt;
-  if (!now || !_storebag.follow(std::move(*now), _sessionID)) return;
-  createBackends(_backends.get());
-  updateSessionWithDefaultSessionInfo();
+  if (!now) return;
+  _storebag.follow(std::move(*now), _sessionID, [this] {
+    createBackends(_backends.get());
+    updateSessionWithDefaultSessionInfo();
+  });
 }
 
 void VeltradSession::createBackends(const BackendSet* before) {
@@ -223,11 +225,7 @@ std::optional<std::string> VeltradSession::sendMessageWithDictionary(Dictionary 
                                                                      wire::Outcomes* outcomes) {
   const auto category = given.uint16(wire::kVeltraMessageParametersCategory);
   const auto type = given.uint16(wire::kVeltraMessageParametersType);
-  Message message{given.takeDictionary(wire::kVeltraMessageParametersPayload),
-                  {},
-                  category.value_or(0),
-                  type.value_or(0),
-                  given.int32(wire::kVeltraMessageParametersFlag).value_or(0)};
+  Message message = messageOf(std::move(given));
   if (!hasBackends(message, Origin::client)) return std::nullopt;
   if (!category) {
     logDebug("sendMessageWithDictionary: Missing mandatory parameter 'category'");
@@ -268,16 +266,16 @@ std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Ou
   const config::EditedFields edits = _word.restrict(message.payload);
   message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
-  fates().taken(message, origin, &edits,
-                _backends->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt);
   sayWithoutUserInfo();
+  CopySent copy;
   const std::int32_t hierarchy = hierarchyOf(_backends.get());
   if (hierarchy > 0 || _aggregation->active()) {
-    const CopySent sent = sendCopy(
-        {_sessionDelegate, *_aggregation, _sessionIDString, _sessionInfo, _userInfo}, hierarchy, message);
-    if (sent.line) logError("%s", sent.line->c_str());
-    if (!sent.to.empty()) _fates.aggregated(message, sent.to);
+    copy = sendCopy({_sessionDelegate, *_aggregation, _sessionIDString, _sessionInfo, _userInfo}, hierarchy,
+                    message);
+    if (copy.line) logError("%s", copy.line->c_str());
   }
+  fates().taken(message, origin, &edits,
+                _backends->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt, copy.to);
   return offerToBackends(*_backends, std::move(message), _services.messageLog, outcomes);
 }
 

@@ -15,6 +15,13 @@ void DeviceIdentity::copyUniqueDeviceID(char* buffer, std::size_t size) {
   buffer[size - 1] = '\0';
 }
 
+std::optional<DeviceIdentity::NameAndType> DeviceIdentity::nameAndType() {
+  auto name = _properties.value("DeviceName");
+  auto type = _properties.value("ProductType");
+  if (!name || !type) return std::nullopt;
+  return NameAndType{std::move(name).value(), std::move(type).value()};
+}
+
 bool DeviceIdentity::mayHaveProductType(std::string_view type) {
   const auto known = _properties.value("ProductType");
   return !known || known.value() == type;

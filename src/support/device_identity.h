@@ -28,6 +28,13 @@ class DeviceIdentity {
   std::optional<std::string> deviceHardwareModel() { return value("HWModelStr"); }
   std::optional<std::string> deviceSerialNumber() { return value("SerialNumber"); }
 
+  // Nothing: they cannot be read just now.
+  struct NameAndType {
+    std::optional<std::string> name;
+    std::optional<std::string> productType;
+  };
+  std::optional<NameAndType> nameAndType();
+
   // Copies the unique ID and a NUL to `buffer`, which has `size` bytes. The buffer is unchanged if there is
   // no ID or it does not fit.
   void copyUniqueDeviceID(char* buffer, std::size_t size);

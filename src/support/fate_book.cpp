@@ -91,7 +91,7 @@ void takeStep(BackendFate& fate, const ToldStep& step) {
 }  // namespace
 
 void FateBook::taken(const ToldMessage& message) {
-  MessageFates fates{message, std::nullopt, {}, {}};
+  MessageFates fates{message, {}, {}};
   ToldStep step;
   step.message = message.entry.message;
   step.entry.step = Step::taken;
@@ -111,7 +111,6 @@ void FateBook::stepped(const ToldStep& step) {
   if (found == _messages.end()) return;
   MessageFates& fates = found->second;
   if (step.entry.backend == 0) {
-    if (step.entry.step == Step::aggregated) fates.aggregatedTo = step.text;
     fates.road.push_back(step);
     return;
   }

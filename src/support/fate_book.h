@@ -37,7 +37,6 @@ struct BackendFate {
 
 struct MessageFates {
   ToldMessage message;
-  std::optional<std::string> aggregatedTo;
   // The steps before it reached the back ends.
   std::vector<ToldStep> road;
   // By name.

@@ -21,7 +21,7 @@ void FateReader::read(std::uint64_t position, const wire::FateWords& words) {
     case EntryKind::message: {
       const auto entry = wire::entryOf<wire::MessageEntry>(words);
       const auto* session = find(_sessions, entry.session);
-      return _listener.taken({position, entry, session ? *session : nullptr});
+      return _listener.taken({position, entry, session ? *session : nullptr, textAt(entry.aggregatedTo)});
     }
     case EntryKind::standing:
       _standings.emplace(position, wire::entryOf<wire::StandingEntry>(words));
@@ -92,8 +92,10 @@ void FateReader::readSession(const wire::SessionEntry& entry) {
 // Those of a batch go into its post, and are forgotten when it has ended.
 std::vector<std::uint64_t> FateReader::messagesOf(const wire::StepEntry& entry) {
   if (entry.message != 0) {
-    if (entry.batch != 0 && entry.step == Step::dropped) {
-      std::erase(_batches[entry.batch], entry.message);
+    if (entry.step == Step::dropped) {
+      const auto batch = _batches.find(entry.batch);
+      if (batch != _batches.end() && std::erase(batch->second, entry.message) > 0 && batch->second.empty())
+        _batches.erase(batch);
     } else if (entry.batch != 0) {
       _batches[entry.batch].push_back(entry.message);
     }

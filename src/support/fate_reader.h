@@ -31,6 +31,8 @@ struct ToldMessage {
   wire::MessageEntry entry;
   // Null: overwritten.
   std::shared_ptr<const ToldSession> session;
+  // The session whose client got a copy.
+  std::optional<std::string> aggregatedTo;
 };
 
 // A step of one message in one back end, or in all of them (0).

@@ -24,41 +24,49 @@ class SpoolFolder {
 
     bool operator<(const Name& other) const { return order < other.order; }
   };
-  // Without an entry: torn, or not there, or not to be read just now.
+  // Without an entry: torn, or not there, or not to be read just now. `bytes`: of the file, also of one that
+  // cannot be read just now.
   struct Read {
     std::optional<SpoolEntry> entry;
     std::size_t bytes = 0;
-    bool torn = false;
-    bool passes = false;  // it cannot be read just now
+    bool torn = false;  // or nobody may read it
+    bool passes = false;
   };
   // What was removed at once.
   struct Removed {
     std::uint64_t posts = 0;
     std::uint64_t events = 0;
     std::uint64_t torn = 0;  // further files, whose posts cannot be read
+    bool all = false;        // no file of a post is left
   };
 
   // The store outlives it. Nothing is made before make().
   SpoolFolder(platform::FileStore& files, std::string directory)
       : _files(files), _directory(std::move(directory)) {}
 
-  // The directory, mode 0700.
+  // The directory, mode 0700, also where there was one.
   Result<Done, std::string> make() const;
-  // Removes what a killed daemon has left unfinished, and lists the others, oldest first.
-  std::vector<Name> names() const;
-  // Written new, synced, renamed, and the directory synced. On failure nothing is left, and there is one
-  // line.
+  // Removes what a killed daemon has left unfinished, and lists the others, oldest first. Files whose time is
+  // ahead of `now`, in seconds since 1970, get names as bringBack() says. Nothing: it cannot be told just
+  // now.
+  std::optional<std::vector<Name>> names(double now) const;
+  // Written new, synced, renamed, and the directory synced. On failure there is one line, and a file may be
+  // left, which is whole.
   Result<Done, std::string> write(const Name& name, std::string_view file) const;
   // The same for a file that is there, and stays as it is if that fails.
   bool rewrite(const Name& name, std::string_view file) const;
+  // What the file says of its order is what its name says.
   Read read(const Name& name) const;
-  void remove(const Name& name) const;
+  // False: it is still there.
+  bool remove(const Name& name) const;
   // All of it, and the directory.
   Removed removeAll() const;
   const std::string& directory() const { return _directory; }
 
  private:
   std::string pathOf(const Name& name) const;
+  Read readFile(const Name& name) const;
+  void bringNamesBack(std::vector<Name>& names, double now) const;
 
   platform::FileStore& _files;
   const std::string _directory;

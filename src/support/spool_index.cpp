@@ -118,14 +118,15 @@ SpoolPlace* SpoolIndex::next(std::uint16_t address, bool oldestAlone,
 }
 
 SpoolPlace* SpoolIndex::oldest() {
-  if (_count == 0 || _places[_begin].state != State::waiting) return nullptr;
+  if (_count == 0 || _places[_begin].state == State::writing || _places[_begin].state == State::sending)
+    return nullptr;
   return &_places[_begin];
 }
 
 SpoolPlace* SpoolIndex::oldestOf(std::uint16_t user) {
   for (std::size_t at = _begin; at < _places.size(); ++at) {
     SpoolPlace& place = _places[at];
-    if (place.user == user && (place.state == State::waiting || place.state == State::writing)) return &place;
+    if (place.user == user && place.state != State::sending && place.state != State::gone) return &place;
   }
   return nullptr;
 }

@@ -16,8 +16,9 @@ namespace veltrad::support {
 
 // 48 bytes, so that the largest spool takes 3 MiB.
 struct SpoolPlace {
-  // writing: not on disk yet. gone: removed, and not yet taken out of the table.
-  enum class State : std::uint8_t { writing, waiting, sending, gone };
+  // writing: not on disk yet. unread: its file could not be read yet, so that its name and bytes alone are
+  // known. gone: removed, and not yet taken out of the table.
+  enum class State : std::uint8_t { writing, waiting, sending, unread, gone };
 
   SpoolFolder::Name name;
   std::uint32_t bytes = 0;  // of its file

@@ -59,8 +59,10 @@ std::size_t nextEquals(std::string_view text, std::size_t from) {
   return from < text.size() ? from : std::string_view::npos;
 }
 
+}  // namespace
+
 // A key is the text between "=" and the last blank before it, so a key with a blank loses its beginning.
-Dictionary itemsOf(std::string_view text) {
+Dictionary itemsOfText(std::string_view text) {
   Dictionary items;
   std::size_t equals = nextEquals(text, 0);
   std::size_t key = equals == std::string_view::npos ? 0 : text.rfind(' ', equals) + 1;
@@ -76,8 +78,6 @@ Dictionary itemsOf(std::string_view text) {
   }
   return items;
 }
-
-}  // namespace
 
 std::optional<std::string> problemOfPacket(std::string_view datagram) {
   if (datagram.size() < kPacketHeaderBytes) return "shorter than the header of 64 bytes";
@@ -112,7 +112,7 @@ Dictionary fieldsOfPacket(std::string_view datagram) {
       {"reliable", (flagBits & kReliable) != 0},
       {"withoutSection", (flagBits & kNoSection) != 0},
       {"text", toUTF8(text)},
-      {"payload", itemsOf(text)},
+      {"payload", itemsOfText(text)},
   };
   if (const auto problem = problemOfPacket(datagram))
     fields.set("problem", *problem);

@@ -17,6 +17,8 @@ inline constexpr std::size_t kMostPacketBytes = kPacketHeaderBytes + 1023;
 // The fields by name, with inverted ones restored, the text, and its items as "payload". "problem" says what
 // is wrong with the datagram; without a whole header there is only "data" besides it.
 Dictionary fieldsOfPacket(std::string_view datagram);
+// The items of a text, as fieldsOfPacket() has them.
+Dictionary itemsOfText(std::string_view text);
 // Why the datagram is none that a daemon sends: its length or its kind; absent if it is one.
 std::optional<std::string> problemOfPacket(std::string_view datagram);
 // Whether it has a whole header and its sender waits for an acknowledgement.

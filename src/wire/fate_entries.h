@@ -12,7 +12,7 @@
 namespace veltrad::wire {
 
 // Changes with the layout of any entry: who reads must know the same.
-inline constexpr std::uint32_t kFateLayout = 1;
+inline constexpr std::uint32_t kFateLayout = 2;
 inline constexpr std::size_t kFateWords = 7;
 using FateWords = std::array<std::uint64_t, kFateWords>;
 
@@ -83,7 +83,9 @@ struct MessageEntry {
   std::uint16_t type = 0;
   std::int32_t flag = 0;
   std::uint8_t reason = kNoReason;  // why it reached no back end
-  std::uint8_t unused[23] = {};
+  std::uint8_t unused[3] = {};
+  FateRef aggregatedTo = 0;  // the session whose client got a copy
+  std::uint8_t more[16] = {};
 };
 
 // How a back end stands, and why.

@@ -20,11 +20,29 @@ TEST(SpoolVerdicts, WhatMayComeThroughLaterIsKept) {
   for (const int status : {200, 204, 301, 400, 401, 403, 404, 410, 413, 501, 505, 600})
     EXPECT_FALSE(backends::isToBeKept(http::HTTPResponse{status, {}, {}})) << status;
   using Kind = HTTPError::Kind;
-  const std::pair<Kind, bool> kinds[] = {{Kind::transport, true}, {Kind::tooMany, true},
-                                         {Kind::stopping, true},  {Kind::tooLarge, false},
-                                         {Kind::shortage, false}, {Kind::refused, false}};
-  for (const auto& [kind, kept] : kinds)
-    EXPECT_EQ(backends::isToBeKept(Failure{HTTPError{kind, "text", 200}}), kept) << static_cast<int>(kind);
+  // Kept; tells of the server.
+  const std::tuple<Kind, bool, bool> kinds[] = {
+      {Kind::transport, true, true}, {Kind::tooMany, true, false},   {Kind::stopping, true, false},
+      {Kind::tooLarge, false, true}, {Kind::shortage, false, false}, {Kind::refused, false, false}};
+  for (const auto& [kind, kept, tells] : kinds) {
+    const http::HTTPResult ended = Failure{HTTPError{kind, "text", 200}};
+    EXPECT_TRUE(backends::isToBeKept(ended) == kept && backends::tellsOfServer(ended) == tells)
+        << static_cast<int>(kind);
+  }
+}
+
+TEST(SpoolVerdicts, ATryIsEachTimeThatThePostWentOutOrFoundNoServer) {
+  http::HTTPResponse answer{200, {}, {}};
+  EXPECT_EQ(backends::triesOf(answer), 1);
+  answer.transmissions = 2;
+  EXPECT_EQ(backends::triesOf(answer), 2);
+  HTTPError waiting{HTTPError::Kind::tooMany, "full"}, unresolved{HTTPError::Kind::transport, "no such host"};
+  unresolved.begun = true;
+  HTTPError cut = unresolved, limited = unresolved;
+  cut.transmissions = 3;
+  limited.refusal = wire::Reason::over_daily_limit;
+  const std::pair<HTTPError, int> rows[] = {{waiting, 0}, {unresolved, 1}, {cut, 3}, {limited, 0}};
+  for (const auto& [error, tries] : rows) EXPECT_EQ(backends::triesOf(Failure{error}), tries);
 }
 
 TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
@@ -41,10 +59,11 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
   hosts.hosts = {{"other.test"}, Array{"other.test"}};
   names.backends = {{"dashboard"}, Array{"dashboard"}};
   const auto open = word({});
-  const backends::ClientFacts yes{true, "US", "Desktop", "Workbench 3", 0.9};
-  backends::ClientFacts no = yes, abroad = yes;
-  no.consent = false;
-  abroad.country = "DE";
+  using Facts = std::optional<backends::ClientFacts>;
+  const Facts yes = backends::ClientFacts{true, "US", "Desktop", "Workbench 3", 0.9}, unknown;
+  Facts no = yes, abroad = yes;
+  no->consent = false;
+  abroad->country = "DE";
   support::SpoolEntry asks, free, hidden;
   asks.url = "https://h.test:1/events";
   asks.asksEntry = true;
@@ -62,8 +81,9 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
     const support::SpoolEntry& post;
     const config::OwnersWord& word;
     const config::StorebagSection* section;
-    const backends::ClientFacts& facts;
+    const Facts& facts;
     std::optional<wire::Reason> reason;
+    bool waits = false;
   } rows[] = {{asks, open, good.get(), yes, none},  // whatever the draw
               {asks, open, good.get(), no, no_consent},
               {asks, open, over.get(), no, none},
@@ -80,10 +100,13 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
               {free, word({}, privacy_off), nullptr, yes, privacy_off},
               {free, word({}, policy_consent), nullptr, no, policy_consent},
               {free, word(hosts), nullptr, yes, policy_hosts},
-              {asks, word(names), good.get(), yes, policy_backends}};
+              {asks, word(names), good.get(), yes, policy_backends},
+              {asks, open, good.get(), unknown, none, true},
+              {free, open, nullptr, unknown, none},
+              {asks, word({}, privacy_off), nullptr, unknown, privacy_off}};
   for (const auto& row : rows) {
-    const auto reason = backends::refusalToLeave(row.post, row.word, row.section, row.facts);
-    EXPECT_TRUE(reason == row.reason) << &row - rows;
+    const auto [reason, waits] = backends::verdictOnLeaving(row.post, row.word, row.section, row.facts);
+    EXPECT_TRUE(reason == row.reason && waits == row.waits) << &row - rows;
     if (reason) {
       const std::string_view text = wire::entryOf(backends::countedFromSpool(*reason)).text;
       EXPECT_TRUE(text.ends_with(": " + std::string(wire::entryOf(*reason).name))) << text;
@@ -140,6 +163,12 @@ TEST(SpoolWait, HeedsWhatTheServerAsksForAndWakesSooner) {
   wait.succeeded();
   wait.left(1200);
   EXPECT_EQ(wait.next(), 1200.25);
+  wait.left(1200.35);  // late, which the pace makes up for
+  EXPECT_EQ(wait.next(), 1200.5);
+  wait.left(1203);  // what was not used is gone
+  EXPECT_EQ(wait.next(), 1203.25);
+  wait.postponed(1204);
+  EXPECT_TRUE(wait.next() == 1204 && !wait.refuses(1203) && wait.nextTry() == 0);
   wait.failed(1300, false, 20, 0.5, "HTTP 429");
   wait.succeeded();  // of a post that had begun before
   EXPECT_TRUE(wait.refuses(1319) && !wait.refuses(1320));

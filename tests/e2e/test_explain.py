@@ -111,7 +111,7 @@ class World:
     def session(self, place):
         pick = self.dice.choice
         names = {"clientName": pick(["phone", "LAMP", "clock", "door"]), "serviceName": pick(["ringer", "x", ""])}
-        info = pick([names, names, {"clientName": "lamp"}, {**names, "room": "r", "a": 7, "b": True}, None])
+        info = pick([names, names, {"clientName": "lamp"}, {**names, "room": "r", "a": pick([7, -0.5, "é", ""]), "b": True}, None])
         messages = [kept({"category": pick([5, 6, 65535]), "type": pick([2, 3]), "flag": pick([0, 0, 0, 1, 2, 3]),
                           "payload": pick([self.payload()] * 9 + [None])}) for _ in range(self.dice.randrange(5))]
         return types.SimpleNamespace(number=(self.number * SESSIONS + place) % 65536, type=pick(CLIENT_TYPES[self.name]), info=info,
@@ -163,7 +163,8 @@ class ExplainedAndDone(SystemTest):
                         break
         print(f"{tried} storebags, {tried * SESSIONS} sessions of seed {SEED}: {dict(sorted(self.seen.items()))}", flush=True)
         self.assertFalse(self.differences, "\n".join(self.differences))
-        self.assertGreater(len(self.seen), 12)
+        if tried >= BAGS_A_DAEMON:
+            self.assertGreater(len(self.seen), 12)
 
     @contextlib.contextmanager
     def serving_group(self, group):

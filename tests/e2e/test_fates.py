@@ -12,6 +12,7 @@ import subprocess
 import tempfile
 
 from harness import Process, Wire, program, storebag, wait_until
+from test_family import Member
 from test_https import HTTPSTest, entry
 
 MESSAGES = int(os.environ.get("VELTRA_FATES", "300"))
@@ -74,6 +75,15 @@ class Fates(FatesTest):
                 self.assertIn(part, text)
             self.assertEqual(self.ctl("why", "--client", "nobody", "--json")[0], "")
 
+    def test_a_field_that_the_user_info_has_lost_leaves_the_messages_own_hashed(self):
+        self.root.write("etc/veltrad/policy.json", b'{"hash": ["room"]}')
+        self.serve(entry())
+        with self.serving():
+            self.client(requireUserInfo=True, user_info={"room": [1]}).message(room="r")
+            self.assertRegex(self.lab.wait_for_events(1, _method=5)[0]["room"], "^[0-9a-f]{64}$")
+            told = [line["backends"]["httppost"] for line in self.why()]
+            self.assertEqual([(one["removed"], one["hashed"]) for one in told], [(["room"], []), ([], ["room"])])
+
     def test_what_the_ring_has_overwritten_is_said_and_all_are_accounted_for(self):
         self.root.write("etc/veltrad/settings.json", b'{"fates": {"bytes": 65536}}')
         self.serve(entry(sampling_threshold=-1, override_sampling=-1))
@@ -90,19 +100,22 @@ class Fates(FatesTest):
 
     def test_watch_tells_each_message_and_step_as_it_happens(self):
         self.serve(entry())
-        with self.serving():
-            session = self.client(requireUserInfo=True)
+        with self.serving("The client has gone."):
+            session = Member(self.root, 7, aggregates=True, service="phone")
+            self.addCleanup(session.close)
             watch = self.watch("--category", "7")
             def told():
                 """The steps of a message that was told of and answered."""
                 session.message(category=7)
                 for first in self.lines(watch, "message"):
-                    self.assertEqual((first["client"], "backends" in first, "payload" in first), ("phone", False, False))
+                    self.assertEqual((first["client"], first["aggregatedTo"], "backends" in first, "payload" in first),
+                                     ("phone", first["session"], False, False))
                     steps = [line["step"] for line in self.lines(watch, "step") if line["message"] == first["message"]]
                     if "answered" in steps:
                         return steps
                 return None
-            self.assertEqual(wait_until(told, "a message and its answer"), ["posted", "answered"])
+            self.assertEqual(wait_until(told, "a message and its answer"), ["aggregated", "posted", "answered"])
+            self.assertTrue(all(line["aggregatedTo"] == line["session"] for line in self.why("--category", "7")))
             watch.popen.send_signal(signal.SIGTERM)
             self.assertEqual(watch.end(), 0)
 
@@ -189,6 +202,9 @@ class Fates(FatesTest):
             nowhere.call(ONE_SHOT, category=7, type=8, payload=values, userInfo={"clientName": "lamp", "serviceName": "hidden-service"},
                          sessionInfo={"clientType": 7, "sessionID": 5, "requireUserInfo": True})
             lines = wait_until(lambda: (found := self.lines(watch, "message"))[-1]["type"] == 8 and found, "the last message")
+            shown = [one for one in json.loads(self.ctl("status", "--json")[0])["sessions"] if one["clientType"] == 7]
+            self.assertIn(("phone", None), [(one["clientName"], one["serviceName"]) for one in shown])
+            self.assertNotIn("hidden", str(shown))
         for line in lines:
             self.assertRegex(line["payload"].pop("number"), "^[0-9a-f]{64}$")
             self.assertEqual(line["payload"], {"kept": values["kept"]})

@@ -49,12 +49,14 @@ class Configuration(SystemTest):
                               ('{"keys": ["a", 1]}', '2:2: "keys" is ["a",1]: expected an array of texts'),
                               ("{", "2:2: "), ("[]", "1:1: the outermost value is not a dictionary")):
             self.root.write(SETTINGS, comments(broken))
-            with self.subTest(broken), self.serving("Settings", "No storebag is accepted for client type 6") as daemon:
+            with self.subTest(broken), self.serving("Settings", "No storebag is accepted for client type 6",
+                                                    "Storebag key not used: ") as daemon:
                 self.assertIsNone(self.open(6)[1])
                 daemon.wait_for_line(f"no storebag is accepted: {self.root.path}/{SETTINGS}:{place}")
-                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1}')
+                self.root.write(SETTINGS, b'{"sampling": "drawn", "speed": 1, "keys": ["k"%s]}' % (b', "k"' * 16))
                 self.assertEqual(self.open(6)[1], ["httppost"])
                 daemon.wait_for_line(':1:23: unknown key "speed": expected one of sampling, storebags, ')
+                daemon.wait_for_line(':1:35: "keys" names 17 files, of which the first 16 are used')
                 self.root.write(SETTINGS, comments(broken))
                 self.assertEqual(self.open(7)[1], ["httppost"])
                 daemon.wait_for_line("Settings could not be read, the last ones stand: ")

@@ -3,10 +3,12 @@
 
 VELTRA_ROUNDS says how often the daemon is killed (10)."""
 import collections
+import contextlib
 import json
 import os
 import random
 import stat
+import subprocess
 import time
 
 from harness import Lab, wait_until
@@ -260,6 +262,41 @@ class Spool(SpoolTest):
             self.assertEqual(sum("could not be kept" in line for line in daemon.text), 1)
 
 
+    def test_a_disk_that_is_full_or_read_only_loses_new_posts_and_goes_on_with_those_that_lie_there(self):
+        """On a file system of its own, where one may be mounted."""
+        state = self.root.path / "var/lib"
+        mount = ["mount", "-t", "tmpfs", "-o", "size=1m", "veltra", state]
+        mounted = subprocess.run(mount, capture_output=True, text=True)
+        if mounted.returncode != 0:
+            self.skipTest("no file system can be mounted: " + mounted.stderr.strip())
+        self.addCleanup(subprocess.run, ["umount", "--lazy", state])
+        self.root.prefer()
+        self.keep(PATIENT)
+        self.spoil()
+        with self.serving("No space left on device", "Read-only file system", "cannot be removed from the spool"):
+            client = self.client()
+            client.message(number=1)
+            self.settled(2)  # with the start message
+            filler = state / "filler"
+            with contextlib.suppress(OSError):
+                filler.write_bytes(bytes(2 << 20))
+            client.message(number=2)
+            self.counted("event lost: the spool's disk", 1)
+            filler.unlink()
+            client.message(number=3)
+            self.settled(3)
+            subprocess.run([*mount[:4], "remount,ro", *mount[5:]], check=True)
+            client.message(number=4)
+            self.counted("event lost: the spool's disk", 2)
+            self.lab.reset()
+            self.ctl("spool", "send")
+            self.counted("post kept: its file could not be removed from the spool", 3)
+            self.assertEqual(len(self.files()), 3)
+            subprocess.run([*mount[:4], "remount,rw", *mount[5:]], check=True)
+            self.settled()
+            self.assertEqual(self.arrived(), [1, 3])
+
+
 class Owner(SpoolTest):
     def filled(self, *arguments, **options):
         """A session's three posts and its start in the spool."""
@@ -289,6 +326,20 @@ class Owner(SpoolTest):
                 self.ctl("spool", "send")
                 self.assertEqual(len(self.lab.received("events")), before)
                 back()
+
+    def test_a_storebag_server_that_hangs_does_not_hold_up_a_withdrawal(self):
+        self.keep(PATIENT)
+        self.spoil()
+        with self.serving():
+            self.filled()
+        self.spoil("/storebags", stall=True)
+        with self.serving():
+            wait_until(lambda: self.status()["posts"] == 5, "what was kept, and the stop message")
+            began = time.monotonic()
+            self.root.prefer(DiagnosticLogSubmissionEnabled=False)
+            wait_until(lambda: not self.files(), "an empty spool")
+            self.assertLess(time.monotonic() - began, 1)
+        self.assertEqual(self.counts()["event dropped: from the spool: no_consent"], 5)
 
     def test_an_entry_that_has_gone_and_a_limit_of_the_day_are_asked_before_a_try(self):
         self.keep(PATIENT)
@@ -324,11 +375,25 @@ class Owner(SpoolTest):
 
     def test_the_history_has_one_record_a_post_with_its_tries(self):
         self.say(history={})
-        self.spoil("/events/phone", script=[{"status": 503, "times": 3}])
+        self.spoil("/events/phone", script=[{"status": 503, "times": 2}, {"cut": True}])
         with self.serving():
-            self.client()
+            client = self.client()
             self.settled()
-            items = wait_until(lambda: [json.loads(line) for line in self.ctl("history", "--json")[0].splitlines()], "a record")
-            self.assertEqual([(item["status"], item["transmissions"], item["client"]) for item in items], [(200, 4, "phone")])
-            shown = self.ctl("history", "show", items[0]["id"])[0]
-            self.assertIn("X-VLT-Post-ID: ", shown)
+
+            def records(count):
+                items = [json.loads(line) for line in self.ctl("history", "--json")[0].splitlines()]
+                return items if len(items) == count else None
+            item, = wait_until(lambda: records(1), "a record")
+            # libcurl repeats what was cut on a kept connection.
+            self.assertEqual((item["status"], item["transmissions"], item["client"], len(self.posts("phone"))), (200, 4, "phone", 4))
+            self.assertIn("X-VLT-Post-ID: ", self.ctl("history", "show", item["id"])[0])
+            # One that was tried, and dropped before it was kept.
+            self.spoil("/events/phone", status=503, delayMs=1000)
+            client.message(number=1)
+            wait_until(lambda: any(backend["underWay"] for session in json.loads(self.ctl("status", "--json")[0])["sessions"]
+                                   for backend in session["backends"]), "a post under way")
+            self.ctl("privacy", "reset-identifiers")
+            dropped, = [each for each in wait_until(lambda: records(2), "another record") if each["id"] != item["id"]]
+            self.assertEqual((dropped["status"], dropped["error"], dropped["transmissions"]), (None, "HTTP 503", 1))
+            self.counted("event dropped: from the spool: refused_by_owner", 1)
+            self.lab.reset()  # the stop message leaves

@@ -119,10 +119,10 @@ class Workshop(unittest.TestCase):
     def test_schema(self):
         schema = json.loads(run("schema")[1])
         good = (bag(), bag(client="a,b c", override_dnu=True, per_country_sampling_thresholds=[{"country": ["US"], "threshold": 1}]),
-                {"version": "1", "release": {"dashboard": {"ip": "10.0.0.1", "port": 1, "reliable": 50}, "ampery": {}}})
+                {"version": "1", "release": {"dashboard": {"ip": "10.0.0.1", "port": 1, "reliable": 50}, "ampery": {"active": True}}})
         bad = (bag(sampling_threshold=2), bag(client="a, b"), bag(filters=[{"key": "a"}]), bag(post_url="http://a"), bag(surprise=1),
                bag(locale_whitelist=[]), {"release": {}}, {"version": "1", "release": {"dashboard": {"ip": "name", "port": 1}}},
-               bag(filters=[{"key": "a ", "action": "remove"}]))
+               bag(filters=[{"key": "a ", "action": "remove"}]), {"version": "1", "release": {"ampery": {"surprise": 1}}})
         done = subprocess.run(["node", "-e", VALIDATOR], env=NODE, input=json.dumps({"schema": schema, "bags": good + bad}),
                               capture_output=True, text=True)
         self.assertEqual((done.returncode, done.stderr), (0, ""))
@@ -153,6 +153,8 @@ class Workshop(unittest.TestCase):
         status, _, error = run("test", self.file("suite", suite))
         self.assertEqual(status, 1)
         self.assertRegex(error, r'suite:1:\d+: unknown key "clientTyp" in "given": did you mean "clientType"')
+        suite["cases"] = [{"given": {"clientType": 7}, "expect": {"htppost": {"absent": ["peer"]}}}]
+        self.assertIn('unknown back end "htppost": did you mean "httppost"?', run("test", self.file("suite", suite))[2])
 
 
     def test_what_is_played_is_checked(self):
@@ -173,6 +175,22 @@ class Workshop(unittest.TestCase):
             self.assertIn(said, told[2])
         told = json.loads(run("explain", "--json", bare, "--client-type", 7, "--country", "us", "--require-user-info", "--client", "x")[1])
         self.assertEqual(told["backends"]["httppost"]["reason"], "reports")
+
+    def test_what_was_removed_or_hashed(self):
+        """As each event leaves: the user info takes the place of the message's fields, and filters come last."""
+        for policy, key, action, given, info, removed, hashed in (
+                ({}, "a", "sha256", "x", 7, [], ["a"]), ({}, "a", "sha256", [1], None, ["a"], []),
+                ({"hash": ["A"]}, "a", "keep", [1], None, ["a"], []), ({"hash": ["A"]}, "a", "keep", [1], 7, [], ["a"]),
+                ({"hash": ["A"]}, "a", "remove", "x", None, ["a"], []), ({"hash": ["A"]}, "a", "sha256", "x", None, [], ["a"]),
+                ({}, "_sender", "sha256", [1], None, [], ["_sender"]),
+                ({"remove": ["_sender"]}, "_sender", "sha256", "x", None, [], ["_sender"])):
+            with self.subTest(policy=policy, key=key, action=action, given=given, info=info):
+                played = self.file("bag", bag(filters=[{"key": key, "action": action}])), self.file("policy.json", policy)
+                told = json.loads(run("explain", "--json", played[0], "--policy", played[1], "--client-type", 7, "--country", "US",
+                                      "--require-user-info", "--client", "x", *(("--user-info", f"a={info}") if info else ()),
+                                      "--category", 5, "--type", 2, "--payload", self.file("payload", {key: given}))[1])
+                post = told["backends"]["httppost"]
+                self.assertEqual((post["removed"], post["hashed"], key in post["events"][1]), (removed, hashed, bool(hashed)))
 
     def edited(self, storebag, edits):
         """The storebag with other values; numbers among "clients" stand for its entries."""

@@ -7,9 +7,11 @@
 #include <cstdint>
 #include <map>
 #include <mutex>
+#include <new>
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 
 #include "base/property_list.h"
 #include "fakes/fake_file_store.h"
@@ -51,6 +53,7 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
  public:
   platform::DeviceProperty value(std::string_view key) override {
     std::lock_guard lock(_mutex);
+    if (std::exchange(_lacksMemory, false)) throw std::bad_alloc();
     if (_short) return Failure{platform::FileFailure{platform::FileFailure::Kind::shortage, "no descriptor"}};
     const auto found = _values.find(key);
     return found == _values.end() ? std::nullopt : std::optional(found->second);
@@ -60,10 +63,13 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
     _values[key] = value;
   }
   void runShort(bool isShort) { _short = isShort; }
+  // The next value cannot be told for want of memory.
+  void lackMemory() { _lacksMemory = true; }
 
  private:
   std::mutex _mutex;
   bool _short = false;
+  bool _lacksMemory = false;
   std::map<std::string, std::string, std::less<>> _values{
       {"ProductVersion", "12"},
       {"BuildVersion", "12A301"},

@@ -101,9 +101,14 @@ class FleetTest(unittest.TestCase):
         cls.fleet = side.Fleet.make(**cls.options)
         cls.addClassCleanup(cls.fleet.remove)
         cls.addClassCleanup(cls.fleet.stop)
+        cls.prepare()
         cls.fleet.start(cls.parts)
         cls.line = cls.fleet.line()
         cls.tls = ssl.create_default_context(cafile=cls.line["ca"])
+
+    @classmethod
+    def prepare(cls):
+        """Before the parts start."""
 
     def direct(self, at=0):
         port = int(self.line["gateways"][at]["listen"].rsplit(":", 1)[1])
@@ -126,7 +131,7 @@ def post_id():
 
 
 def packed(bytes_):
-    return gzip.compress(bytes_)
+    return gzip.compress(bytes_, 1)
 
 
 def together(works):

@@ -13,13 +13,10 @@ os.environ["VELTRA_BUILD"] = str(pathlib.Path(os.environ.get("VELTRA_BUILD", HER
 sys.path[:0] = [str(HERE), str(HERE.parents[1] / "fleet")]
 import side  # noqa: E402
 
-NEEDED = ("veltra-gateway", "nats-server", "nginx", "postgres", "initdb", "psql", "openssl")
-
 
 def main(names):
     try:
-        for name in NEEDED:
-            side.program(name)
+        side.check_programs()
     except side.Missing as missing:
         print(f"the fleet's tests are left out: {missing}")
         print("0 passed, 0 failed")

@@ -6,10 +6,14 @@ import json
 import os
 import pathlib
 import plistlib
+import re
+import signal
 import socket
 import subprocess
+import tempfile
 import time
 import unittest
+import urllib.parse
 import urllib.request
 
 import side
@@ -49,7 +53,9 @@ class Doors(FleetTest):
                     self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
                     if where == "direct":
                         self.assertTrue(answer.headers["X-VLT-Refused"])
-            self.assertIn(door.request("GET", "/events").status, (403, 405))
+            for path in ("/events", "/upload", "/logdata"):
+                answer = door.request("GET", path)
+                self.assertEqual((answer.status, answer.body, answer.headers["Allow"]), (405, b"", "POST"))
             door.close()
             large = door.request("POST", "/events", good, {**JSON, "X-Large": "x" * 65536})
             self.assertIn(large.status, (400, 431))
@@ -89,6 +95,17 @@ class Doors(FleetTest):
         self.assertEqual(self.fleet.query("SELECT count(*) FROM veltra.posts"
                                           f" WHERE encode(id, 'hex') = '{identifier}'"), [["1"]])
 
+    def test_files_are_kept_once_whatever_they_are_called(self):
+        door, path = self.direct(), "/upload?uuid=names&sequence=1&raw=true&filename="
+        names = ["Nats-Msg-Id", "Nats-Msg-Id:x", "Nats-Rollup:all", "\\Nats-"]
+        rows = [(name, b"content") for name in names * 2] + [("a", b"bc"), ("ab", b"c"), ("last", b"")]
+        for name, content in rows:
+            answer = door.request("POST", path + urllib.parse.quote(name), packed(content), GZIP)
+            self.assertEqual((answer.status, answer.body), (200, b'{"success":true}'), name)
+        self.rows("SELECT 1 FROM veltra.files WHERE filename = 'last'", 1)
+        self.assertEqual([name for name, in self.fleet.query("SELECT filename FROM veltra.files WHERE uuid = 'names' ORDER BY seq")],
+                         [*names, "a", "ab", "last"])
+
     def test_bodies_larger_than_a_message(self):
         text = os.urandom(3 << 20).hex()
         self.assertEqual(self.direct().post("/events", packed(envelope({"t": text}, client="large")), Content_Encoding="gzip").status, 200)
@@ -98,7 +115,7 @@ class Doors(FleetTest):
         body = packed(content)
         answer = self.through().request("POST", "/upload?uuid=ab&sequence=7&description=a%20log&filename=a%20b.gz&raw=true", body, GZIP)
         self.assertEqual((answer.status, answer.body), (200, b'{"success":true}'))
-        [row] = self.rows("SELECT uuid, sequence, filename, description, encode(sha256, 'hex'), bytes, path FROM veltra.files", 1)
+        [row] = self.rows("SELECT uuid, sequence, filename, description, encode(sha256, 'hex'), bytes, path FROM veltra.files WHERE uuid = 'ab'", 1)
         self.assertEqual(row[:6], ["ab", "7", "a b.gz", "a log", hashlib.sha256(content).hexdigest(), str(len(content))])
         self.assertEqual(gzip.decompress((pathlib.Path(self.line["files"]) / row[6]).read_bytes()), content)
         items = ["a line", {"level": 3, "nul": "\0"}, ["x" * 2_000_000]]
@@ -122,6 +139,18 @@ class Doors(FleetTest):
         self.assertEqual(row[:7], ["d" * 40, "FU", "77", "3", "5", "10", "3"])
         self.assertEqual(json.loads(row[7]), {"a": "1", "b": "x=y z", "c": "�"})
         self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.datagrams WHERE event_number = 2")), 1)
+        self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
+        self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
+
+    def test_storebags_go_back(self):
+        door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
+        self.fleet.publish("ostvane", bags[0])
+        first = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.publish("ostvane", bags[1])
+        second = door.request("GET", "/bags/maple/ostvane")
+        self.fleet.storebag("rollback", "ostvane", "bags")
+        back = door.request("GET", "/bags/maple/ostvane", headers={"If-Modified-Since": second.headers["Last-Modified"]})
+        self.assertEqual((back.status, back.body), (200, first.body))
 
     def test_storebags_come_from_nginx_alone(self):
         bag = json.dumps({"version": "1", "release": {}})
@@ -133,23 +162,56 @@ class Doors(FleetTest):
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 304)
         self.fleet.publish("quindle", bag.replace('"1"', '"2"'))
         self.assertEqual(door.request("GET", "/bags/maple/quindle", headers=again).status, 200)
-        missing = door.request("GET", "/bags/maple/nothing")
-        self.assertEqual((missing.status, missing.body), (404, b""))
+        for path in ("nothing", "", ".before/quindle/1", "quindle/x"):
+            missing = door.request("GET", "/bags/maple/" + path)
+            self.assertEqual((missing.status, missing.body), (404, b""), path)
 
 
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
 
-    def gateway(self, *arguments, hold="0.5"):
-        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", "127.0.0.1:0",
+    def test_listens_on_a_socket_that_others_may_use(self):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder) / "gateway.sock"
+            with socket.socket(socket.AF_UNIX) as left:
+                left.bind(str(path))  # as a gateway that was killed leaves it
+            process, _, _ = self.gateway(listen=f"unix:{path}")
+            self.assertEqual(path.stat().st_mode & 0o777, 0o666)
+            with socket.socket(socket.AF_UNIX) as link:
+                link.connect(str(path))
+                link.sendall(b"GET /events HTTP/1.1\r\nHost: h\r\n\r\n")
+                self.assertTrue(link.recv(1000).startswith(b"HTTP/1.1 405"))
+            process.terminate()
+            self.assertEqual(process.wait(15), 0)
+            self.assertFalse(path.exists())
+            path.write_text("not a socket")
+            refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
+                                     capture_output=True, text=True)
+            self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
+
+    def test_connections_between_requests_keep_little(self):
+        process, first, _ = self.gateway()
+
+        def resident():
+            return int(re.search(r"^VmRSS:\s+(\d+)", pathlib.Path(f"/proc/{process.pid}/status").read_text(), re.M)[1])
+        self.assertEqual(first.post("/events", b"{}").status, 400)
+        before, doors = resident(), [Door(first.address) for _ in range(600)]
+        for door in doors:
+            self.addCleanup(door.close)
+        self.assertEqual({door.post("/events", b"{}").status for door in doors}, {400})
+        self.assertLess((resident() - before) / len(doors), 9, "KiB; the room for a body is 16")
+
+    def gateway(self, *arguments, hold="0.5", listen="127.0.0.1:0"):
+        process = subprocess.Popen([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", listen,
                                     "--admin", "127.0.0.1:0", "--hold", hold, *arguments], stdout=subprocess.PIPE,
                                    stderr=subprocess.DEVNULL, text=True)
         self.addCleanup(process.stdout.close)
         self.addCleanup(process.wait)
         self.addCleanup(process.kill)
         line = json.loads(process.stdout.readline())
-        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1])))
-        self.addCleanup(door.close)
+        door = Door(("127.0.0.1", int(line["listen"].rsplit(":", 1)[1]))) if line["listen"].startswith("http") else None
+        if door:
+            self.addCleanup(door.close)
         return process, door, line
 
     def test_what_is_held_too_long_is_to_come_again(self):
@@ -187,3 +249,37 @@ class Alone(unittest.TestCase):
             process.terminate()
             self.assertTrue(waiting.recv(100).startswith(b"HTTP/1.1 429"))
         self.assertEqual(process.wait(15), 0)
+
+    def test_a_file_is_refused_as_soon_as_a_piece_was_not_taken(self):
+        _, door, _ = self.gateway()
+        with socket.create_connection(door.address, timeout=10) as sending:
+            sending.sendall(b"POST /upload?sequence=1 HTTP/1.1\r\nHost: h\r\nContent-Encoding: gzip\r\nContent-Length: %d\r\n\r\n" % (1 << 30))
+            sending.sendall(packed(os.urandom(2_500_000)))
+            self.assertTrue(sending.recv(1000).startswith(b"HTTP/1.1 429"))
+
+    def test_small_bodies_that_become_large_cost_little(self):
+        process, door, _ = self.gateway("--hold-bytes", str(1 << 30))
+        values = b'{"clientId":"c","events":[' + b"1," * ((8 << 20) - 20) + b"1]}"
+        texts = plistlib.dumps(["\1" * (1 << 20)] * 8, fmt=plistlib.FMT_BINARY)
+        zipped = {**JSON, "Content-Encoding": "gzip"}
+        for path, body, headers, status in (("/events", packed(values), zipped, 400), ("/logdata", packed(texts), GZIP, 413),
+                                            ("/upload?sequence=1", gzip.compress(bytes(40 << 20)), GZIP, 413)):
+            with self.subTest(path=path):
+                self.assertLess(len(body), 100_000)
+                answer = door.request("POST", path, body, headers)
+                self.assertEqual((answer.status, answer.body), (status, b""), answer.headers)
+        status = pathlib.Path(f"/proc/{process.pid}/status").read_text()
+        self.assertLess(int(re.search(r"VmHWM:\s+(\d+) kB", status)[1]), 250_000)
+
+    def test_datagrams_that_the_kernel_dropped_are_counted(self):
+        process, _, line = self.gateway("--dashboard", "127.0.0.1:0")
+        dashboard = Dashboard(line["dashboard"])
+        process.send_signal(signal.SIGSTOP)
+        for number in range(20_000):
+            dashboard.socket.send(datagram(1, b" a=" + b"x" * 1000))
+        process.send_signal(signal.SIGCONT)
+
+        def dropped():
+            dashboard.socket.send(datagram(2))
+            return re.search(rb'datagrams_total{result="dropped"} [1-9]', urllib.request.urlopen(line["admin"] + "/metrics").read())
+        side.wait_until(dropped, "the number of those that were dropped", 20)

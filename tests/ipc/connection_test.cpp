@@ -3,6 +3,9 @@
 #include <fcntl.h>
 #include <poll.h>
 
+#include <atomic>
+#include <new>
+
 #include "harness.h"
 
 namespace veltrad::ipc_test {
@@ -116,6 +119,32 @@ class StartingSession final : public AnsweringSession {
  private:
   Gate& _gate;
 };
+
+struct ForgetfulDoor : Door {
+  struct Session final : AnsweringSession {
+    explicit Session(ForgetfulDoor& itsDoor) : door(itsDoor) {}
+    void takeNews() override {
+      if (door.lacksMemory) throw std::bad_alloc();
+      door.journal.add("news");
+    }
+    ForgetfulDoor& door;
+  };
+  bool listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) override {
+    connection->setExportedObject(std::make_shared<Session>(*this));
+    connection->resume();
+    connection->nudge();
+    return true;
+  }
+  std::atomic<bool> lacksMemory{true};
+};
+
+TEST(Connection, TakesItsNewsLaterIfThereIsNoMemoryAlsoForASilentClient) {
+  ForgetfulDoor door;
+  const WireEnd client = door.client();
+  EXPECT_EQ(door.journal.lines(), std::vector<std::string>());
+  door.lacksMemory = false;
+  EXPECT_TRUE(door.journal.waitForLines(1));
+}
 
 struct StartingDoor : Door {
   bool listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) override {

@@ -4,7 +4,26 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+#include <new>
+
 #include "base/property_list.h"
+
+namespace {
+thread_local bool thereIsNoMemory = false;
+}  // namespace
+
+void* operator new(std::size_t size) {
+  void* memory = thereIsNoMemory ? nullptr : std::malloc(size);
+  if (!memory) throw std::bad_alloc();
+  return memory;
+}
+void operator delete(void* memory) noexcept {
+  std::free(memory);
+}
+void operator delete(void* memory, std::size_t) noexcept {
+  std::free(memory);
+}
 
 namespace veltrad {
 namespace {
@@ -36,6 +55,20 @@ TEST(WatchedContents, NothingIsKeptOnceNobodyWatches) {
   keep(4);
   EXPECT_TRUE(contents.copy(0).pieces.empty());
   EXPECT_EQ(contents.next(), 3u);
+}
+
+TEST(WatchedContents, WithoutMemoryLosesWhatOneMessageHolds) {
+  WatchedContents contents;
+  const auto watch = contents.watch();
+  const Dictionary payload{{"text", std::string(100, 'x')}};
+  for (const std::uint64_t message : {1u, 2u, 3u}) {
+    thereIsNoMemory = message == 2;
+    contents.keep(message, &payload, &kUserInfo);
+    thereIsNoMemory = false;
+  }
+  const auto copy = contents.copy(0);
+  ASSERT_EQ(copy.pieces.size(), 2u);
+  EXPECT_EQ(copy.pieces[1].message, 3u);
 }
 
 TEST(WatchedContents, TheOldestMakeRoomAndAnAnswerFitsAFrame) {

@@ -15,6 +15,13 @@ std::string packed(const std::string& text) {
   return *GzipCompressor().gzipDeflate({text}, 6);
 }
 
+// Returns how often it took.
+int add(Gunzip& gunzip, std::string_view piece, const std::function<void(std::string_view)>& sink) {
+  int times = 1;
+  for (; gunzip.add(piece, sink) == State::open && !piece.empty(); ++times) continue;
+  return times;
+}
+
 TEST(Gunzip, TellsWhatAStreamIs) {
   const std::string text(100'000, 'a');
   const std::string whole = packed(text);
@@ -41,12 +48,26 @@ TEST(Gunzip, TellsWhatAStreamIs) {
       Gunzip gunzip(row.most);
       std::string out;
       for (std::size_t at = 0; at < row.bytes.size(); at += piece)
-        gunzip.add(std::string_view(row.bytes).substr(at, piece),
-                   [&out](std::string_view more) { out += more; });
+        add(gunzip, std::string_view(row.bytes).substr(at, piece),
+            [&out](std::string_view more) { out += more; });
       EXPECT_EQ(gunzip.state(), row.state);
       if (row.state == State::ended) EXPECT_EQ(out, text);
       EXPECT_LE(out.size(), row.most);
     }
+  }
+}
+
+TEST(Gunzip, TakesASmallPieceThatBecomesLargeInManyTurns) {
+  const std::pair<std::size_t, State> rows[] = {{32u << 20, State::ended}, {33u << 20, State::tooLarge}};
+  for (const auto& [size, state] : rows) {
+    const std::string bytes = packed(std::string(size, 'a'));
+    Gunzip gunzip(1u << 30);
+    std::size_t largest = 0;
+    const int times =
+        add(gunzip, bytes, [&](std::string_view more) { largest = std::max(largest, more.size()); });
+    EXPECT_EQ(gunzip.state(), state) << size;
+    EXPECT_LE(largest, 64u << 10);
+    EXPECT_GE(times, 512);
   }
 }
 

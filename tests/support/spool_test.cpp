@@ -7,8 +7,10 @@
 #include <fstream>
 
 #include "base/property_list.h"
+#include "fakes/few_descriptors.h"
 #include "fakes/temporary_directory.h"
 #include "platform/file_store.h"
+#include "support/spool_age.h"
 #include "support/spool_entry.h"
 #include "support/spool_folder.h"
 #include "support/spool_index.h"
@@ -84,8 +86,9 @@ TEST(SpoolFolder, KeepsWholeFilesOfItsOwnerAndRemovesWhatIsUnfinished) {
   }
   put("000000000000000f." + support::textOf(written[0].id) + ".0123abcd.new", "half");
   put("another", "");
-  const auto names = folder.names();
-  ASSERT_EQ(names.size(), 3u);
+  const auto listed = folder.names(0);
+  ASSERT_TRUE(listed && listed->size() == 3);
+  const auto& names = *listed;
   EXPECT_TRUE(names[0].order == 10 && names[1].order == 20 && names[2].order == 30);
   EXPECT_EQ(folder.read(names[1]).entry->id, names[1].id);
   EXPECT_EQ(std::distance(std::filesystem::directory_iterator(folder.directory()), {}), 4);
@@ -95,8 +98,58 @@ TEST(SpoolFolder, KeepsWholeFilesOfItsOwnerAndRemovesWhatIsUnfinished) {
   EXPECT_TRUE(!folder.read(names[1]).entry && !folder.read(names[1]).torn);
   std::filesystem::remove(folder.directory() + "/another");
   const auto removed = folder.removeAll();
-  EXPECT_TRUE(removed.posts == 1 && removed.events == 3 && removed.torn == 1);
+  EXPECT_TRUE(removed.posts == 1 && removed.events == 3 && removed.torn == 1 && removed.all);
   EXPECT_FALSE(std::filesystem::exists(folder.directory()));
+}
+
+TEST(SpoolFolder, IsClosedToOthersAndListedWhenThereAreDescriptors) {
+  const TemporaryDirectory directory;
+  platform::DiskFileStore files;
+  const support::SpoolFolder folder(files, directory.path() + "/spool");
+  ASSERT_TRUE(std::filesystem::create_directory(folder.directory()));
+  std::filesystem::permissions(folder.directory(), std::filesystem::perms(0755));
+  ASSERT_TRUE(folder.make());
+  EXPECT_EQ(std::filesystem::status(folder.directory()).permissions(), std::filesystem::perms(0700));
+  // Two posts under a clock that was in the year 2040, and two of now.
+  constexpr std::uint64_t kAhead = 2'208'988'800'000'000, kNow = 1'790'000'000'000'000;
+  const SpoolEntry before = post(kNow - 5), first = post(kAhead), second = post(kAhead + 7), now = post(kNow);
+  for (const SpoolEntry& one : {second, before, now, first})
+    ASSERT_TRUE(folder.write({one.order, one.id}, support::writeSpoolEntry(one)));
+  {
+    const FewDescriptors none;
+    EXPECT_FALSE(folder.names(kNow / 1e6));
+    EXPECT_TRUE(folder.read({now.order, now.id}).passes);
+    EXPECT_FALSE(folder.removeAll().all);
+  }
+  const std::pair<std::uint64_t, support::PostID> brought[] = {
+      {kNow - 5, before.id}, {kNow - 2, now.id}, {kNow - 1, first.id}, {kNow, second.id}};
+  for (int turn = 0; turn < 2; ++turn) {  // the second time, nothing is left to do
+    const auto names = folder.names(kNow / 1e6);
+    ASSERT_TRUE(names && names->size() == 4);
+    for (std::size_t i = 0; i < 4; ++i) {
+      EXPECT_TRUE((*names)[i].order == brought[i].first && (*names)[i].id == brought[i].second) << i;
+      EXPECT_EQ(folder.read((*names)[i]).entry->order, brought[i].first);
+    }
+  }
+}
+
+TEST(SpoolAge, CountsDaysByTheClockOrWhereItWasWrongByTheTimeThatHasPassed) {
+  constexpr double kDay = 86'400, kNow = 1'790'000'000;
+  const auto order = [](double time) { return static_cast<std::uint64_t>(time * 1e6); };
+  support::SpoolAge age(7 * kDay);
+  const std::uint64_t good = order(kNow - kDay), ahead = order(kNow + 1000 * kDay), early = order(1000);
+  EXPECT_EQ(age.tooOldBefore(kNow, 0, good, good), order(kNow - 7 * kDay));
+  for (const std::uint64_t oldest : {ahead, early}) {
+    EXPECT_EQ(age.tooOldBefore(kNow, 1000, oldest, ahead + 9), 0u);
+    EXPECT_EQ(age.tooOldBefore(kNow, 1000 + 6 * kDay, oldest, ahead + 20), 0u);
+    EXPECT_EQ(age.tooOldBefore(kNow, 1000 + 7 * kDay, oldest, ahead + 20), ahead + 10);
+    // Those that were made meanwhile have days of their own.
+    EXPECT_EQ(age.tooOldBefore(kNow, 1000 + 8 * kDay, ahead + 12, ahead + 20), 0u);
+    EXPECT_EQ(age.tooOldBefore(kNow, 1000 + 15 * kDay, ahead + 12, ahead + 20), ahead + 21);
+    age.tooOldBefore(kNow, 0, good, good);  // well again
+  }
+  EXPECT_EQ(age.tooOldBefore(1000, 0, good, good), 0u);  // no clock at all
+  EXPECT_EQ(age.tooOldBefore(kNow, 0, good, good), order(kNow - 7 * kDay));
 }
 
 class SpoolIndexTest : public ::testing::Test {

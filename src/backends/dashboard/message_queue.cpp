@@ -65,25 +65,14 @@ MessageQueue::Tick MessageQueue::tick() {
 }
 
 MessageQueue::Sending MessageQueue::send(const UDPPacketToSend& record) {
-  const Sending result = _send(record.data, false);
+  const Sending result = _send(record.data, record.state == UDPPacketToSend::notSent);
   if (result == Sending::done && _copies && _reliableUDP) _copies->sent(record.serial, record.eventNumber);
   return result;
 }
 
-bool MessageQueue::forbid(const UDPPacketToSend& record, Tick& result) {
-  const bool sent = record.state != UDPPacketToSend::notSent;
-  ++result.forbidden;
-  _tell(record.message, sent ? wire::Step::given_up : wire::Step::dropped,
-        wire::Reason::datagram_over_daily_limit);
-  recordEnd(record, kNotAcknowledged);
-  return true;
-}
-
 bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (record.state == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
-  const Sending sending = send(record);
-  if (sending == Sending::forbidden) return forbid(record, result);
-  if (sending == Sending::notTaken) return false;
+  if (send(record) == Sending::notTaken) return false;
   ++result.sent;
   _tell(record.message, wire::Step::sent, wire::Reason::datagram_sent);
   record.state = UDPPacketToSend::awaitsAcknowledgement;
@@ -105,8 +94,13 @@ bool MessageQueue::checkAcknowledgement(UDPPacketToSend& record, Tick& result) {
     return false;
   }
   const Sending sending = send(record);
-  if (sending == Sending::forbidden) return forbid(record, result);
   if (sending == Sending::notTaken) return false;
+  if (sending == Sending::forbidden) {
+    ++result.forbidden;
+    _tell(record.message, wire::Step::given_up, wire::Reason::datagram_over_daily_limit);
+    recordEnd(record, kNotAcknowledged);
+    return true;
+  }
   record.numberOfChecks = 0;
   ++record.numberOfRetransmits;
   ++result.sentAgain;

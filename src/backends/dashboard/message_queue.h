@@ -27,7 +27,7 @@ class MessageQueue {
   static constexpr std::size_t maxPendingSharedPackets = 1024;
   // notTaken: not all bytes were sent. forbidden: by the owner's limit for the day.
   enum class Sending { done, notTaken, forbidden };
-  // `first`: it has not been tried before; then nothing forbids it.
+  // `first`: it has never been sent. It was counted when it was taken in, so nothing forbids it.
   using Send = std::function<Sending(std::string_view datagram, bool first)>;
   // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
   // or acknowledged.
@@ -84,7 +84,6 @@ class MessageQueue {
  private:
   Sending send(const UDPPacketToSend& record);
   // These return true if the record is to be removed.
-  bool forbid(const UDPPacketToSend& record, Tick& result);
   bool check(UDPPacketToSend& record, Tick& result);
   bool checkAcknowledgement(UDPPacketToSend& record, Tick& result);
   std::uint64_t recordSent(std::string_view datagram, const DatagramOwner& owner) const;

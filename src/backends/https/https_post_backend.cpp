@@ -331,7 +331,7 @@ void HTTPSPostBackend::noteEdits(const SessionFacts& facts, const NumberedMessag
   if (edits.empty() && !facts.userInfoEdits) return;
   config::NotedChanges changes(
       pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
-  if (facts.userInfoEdits) changes.changed(*facts.userInfoEdits);
+  if (facts.userInfoEdits) changes.changed(*facts.userInfoEdits, message.note.edits);
   changes.changed(edits);
 }
 

@@ -2,7 +2,12 @@
 // Files, reads and drops posts.
 #include "backends/https/post_spool.h"
 
+#include <time.h>
+
+#include <algorithm>
+#include <future>
 #include <new>
+#include <utility>
 
 #include "backends/https/post_request.h"
 #include "backends/https/spool_verdicts.h"
@@ -28,6 +33,13 @@ http::DepartureEnd endOf(const http::HTTPResult& result) {
   return end;
 }
 
+// Goes on while the machine sleeps, and nobody sets it.
+double runningSeconds() {
+  timespec time{};
+  ::clock_gettime(CLOCK_BOOTTIME, &time);
+  return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
+}
+
 NotedPost notedPost(const support::SpoolPlace& place) {
   return {place.backend, place.fate};
 }
@@ -50,8 +62,9 @@ PostSpool::PostSpool(const SpoolServices& services, SpoolSettings settings)
       _counters(services.counters),
       _rules(services.rules),
       _notes(services.rules.gate, services.fates),
-      _secondsKept(settings.days * 86'400),
+      _age(settings.days * 86'400),
       _folder(services.files, std::move(settings.directory)),
+      _removals(_folder, services.counters),
       _queue(services.clock, settings.bounds, settings.pace),
       _jobs(services.writer, kMostWaitingBytes) {}
 
@@ -75,11 +88,10 @@ std::optional<std::string> PostSpool::admit(SpooledPost& post) {
 void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result) {
   support::SpoolEntry& entry = post->entry;
   const std::string address = http::addressOf(entry.url);
-  // One that the day's limit refused has begun, but not left.
-  if (result || (result.error().begun && result.error().refusal != Reason::over_daily_limit)) ++entry.tries;
+  entry.tries = static_cast<std::uint16_t>(triesOf(result));
   if (isToBeKept(result)) {
     entry.lastError = outcomeOf(result);
-    _queue.failed(address, result);
+    if (tellsOfServer(result)) _queue.failed(address, result);
     return file(post);
   }
   if (entry.tries > 0) _notes.record(entry, entry.tries, endOf(result));
@@ -96,7 +108,8 @@ void PostSpool::file(const std::shared_ptr<SpooledPost>& post) {
   const support::SpoolEntry& entry = post->entry;
   if (!_queue.add(placeOf(entry, post->fate), http::addressOf(entry.url), entry.uid, post->emptied)) {
     _counters.count(Reason::spool_refused_by_owner, entry.events);
-    return _notes.dropped(notedPost(placeOf(entry, post->fate)), Reason::refused_by_owner);
+    _notes.dropped(notedPost(placeOf(entry, post->fate)), Reason::refused_by_owner);
+    return recordUnsent(entry, entry.tries);
   }
   using Put = platform::DiskWriter::Queue::Put;
   const std::size_t bytes = entry.body.size() + entry.url.size();
@@ -110,27 +123,37 @@ void PostSpool::file(const std::shared_ptr<SpooledPost>& post) {
   if (_jobs.put(job, bytes) != Put::taken) drop({entry.order, entry.id}, Reason::spool_disk, &entry);
 }
 
-// On the disk writer's thread.
+// On the disk writer's thread. Whoever has dropped it meanwhile had no copy of it to record.
 void PostSpool::write(const SpooledPost& post) {
+  if (!keepOnDisk(post)) recordUnsent(post.entry, post.entry.tries);
+}
+
+// False: somebody else has dropped it.
+bool PostSpool::keepOnDisk(const SpooledPost& post) {
   const support::SpoolEntry& entry = post.entry;
   const Name name{entry.order, entry.id};
-  if (const auto refused = refusalOf(entry)) return drop(name, *refused, &entry);
+  if (const auto refused = verdict(entry, _rules.facts()).refusal) return drop(name, *refused, &entry);
   const std::string bytes = support::writeSpoolEntry(entry);
-  if (!_queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()))) return;  // emptied
+  if (!_queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()))) return false;
   makeRoom();
-  if (!_queue.holds(name.order)) return;  // it was the oldest of those that take too much
-  const auto written = _folder.write(name, bytes);
-  if (!written) {
+  if (!_queue.holds(name.order)) return false;  // it was the oldest of those that take too much
+  if (const auto written = _folder.write(name, bytes); !written) {
     const auto line = _diskLine.happened("A post could not be kept: " + written.error());
     if (line) logError("%s", line->c_str());
-    return drop(name, Reason::spool_disk, &entry);
+    const bool dropped = drop(name, Reason::spool_disk, &entry);
+    _removals.remove(name);  // it may be there, and its name not on disk
+    return dropped;
   }
-  if (!_queue.written(name.order)) return _folder.remove(name);  // emptied
+  if (!_queue.written(name.order)) {
+    _removals.remove(name);
+    return false;
+  }
   _counters.count(Reason::kept_in_spool, entry.events);
   SpoolQueue::AddressStatus address;
   const auto place = _queue.place(name.order, address);
   if (place) _notes.kept(notedPost(*place), entry.lastError, _queue.waitAt(place->address));
   wake();
+  return true;
 }
 
 void PostSpool::makeRoom() {
@@ -139,31 +162,60 @@ void PostSpool::makeRoom() {
     drop(*name, why == support::SpoolIndex::Excess::share ? Reason::spool_share : Reason::spool_full);
 }
 
-void PostSpool::drop(const Name& name, Reason reason, const support::SpoolEntry* post) {
+bool PostSpool::drop(const Name& name, Reason reason, const support::SpoolEntry* post) {
   const auto place = _queue.takeOut(name.order);
-  if (!place) return;
+  if (!place) return false;
+  if (place->state == State::unread) {
+    dropUnread(name, reason);
+    return true;
+  }
   const bool onDisk = place->state != State::writing;
   // What was kept has been settled before.
   if (onDisk) _counters.eventTaken(place->events);
   _counters.count(countedFromSpool(reason), place->events);
   _notes.dropped(notedPost(*place), reason);
-  if (place->tries > 0 && _notes.keepsRecords()) {
-    const auto kept = post || !onDisk ? std::nullopt : read(name).entry;
-    if (!post && kept) post = &*kept;
-    http::DepartureEnd end;
-    if (post) end.error = post->lastError;
-    if (post) _notes.record(*post, place->tries, end);
+  // Whoever writes or sends it has a copy, and records it.
+  const bool records = place->tries > 0 && _notes.keepsRecords() &&
+                       (place->state == State::waiting || (place->state == State::writing && post));
+  const auto kept = records && !post ? read(name).entry : std::nullopt;
+  if (onDisk) _removals.remove(name);
+  if (kept) post = &*kept;
+  if (records && post) recordUnsent(*post, place->tries);
+  return true;
+}
+
+void PostSpool::dropUnread(const Name& name, Reason reason) {
+  const support::SpoolFolder::Read found = read(name);
+  if (found.torn) _counters.count(Reason::spool_torn);
+  if (found.entry) {
+    _counters.eventTaken(found.entry->events);
+    _counters.count(countedFromSpool(reason), found.entry->events);
   }
-  if (onDisk) _folder.remove(name);
+  _removals.remove(name);
+  if (found.entry) recordUnsent(*found.entry, found.entry->tries);
+}
+
+void PostSpool::recordUnsent(const support::SpoolEntry& post, int tries) const {
+  if (tries == 0) return;
+  http::DepartureEnd end;
+  end.error = post.lastError;
+  try {
+    _notes.record(post, tries, end);
+  } catch (const std::bad_alloc&) {
+    logWarning("A post that was dropped from the spool is not in the history: no memory");
+  }
 }
 
 std::size_t PostSpool::empty(Reason reason, Deadline deadline) {
-  static_cast<void>(_queue.waitUntilLoaded(deadline));
+  list();
+  const auto unread = _backlog.takeAll(deadline);
+  if (!unread) dropUnlisted(reason);
   const auto names = _queue.empty();
   for (const Name& name : names) drop(name, reason);
+  for (const Name& name : unread.value_or(std::vector<Name>())) dropUnread(name, reason);
   // What was being written removes itself.
   static_cast<void>(drain(deadline));
-  return names.size();
+  return names.size() + (unread ? unread->size() : 0);
 }
 
 std::size_t PostSpool::sendNow() {
@@ -182,48 +234,88 @@ bool PostSpool::drain(Deadline deadline) {
 
 // By the disk writer, so that nothing is written meanwhile.
 void PostSpool::list() {
-  const auto listed = std::make_shared<std::promise<std::vector<Name>>>();
-  _listed = listed->get_future();
-  using Put = platform::DiskWriter::Queue::Put;
-  const auto put = _jobs.put([this, listed] { listed->set_value(_folder.names()); }, 1);
-  if (put != Put::taken) listed->set_value({});
+  if (!_backlog.isToBeListed()) return;
+  const auto job = [this] {
+    try {
+      _backlog.listed(_folder.names(platform::timevalToSeconds(_clock.now())));
+    } catch (const std::bad_alloc&) {
+      _backlog.listed(std::nullopt);
+    }
+    wake();
+  };
+  if (_jobs.put(job, 1) != platform::DiskWriter::Queue::Put::taken) _backlog.listed(std::nullopt);
 }
 
-void PostSpool::load(const std::function<bool()>& stops) {
-  for (const Name& name : _listed.get()) {
-    if (stops()) return;
-    const support::SpoolFolder::Read found = read(name);
-    const auto& entry = found.entry;
-    if (found.torn) {
-      _counters.count(Reason::spool_torn);
-      logWarning("A post in the spool is torn, and removed: %s", support::textOf(name.id).c_str());
-      _folder.remove(name);
+std::optional<double> PostSpool::loadSome(const Each& each) {
+  constexpr std::chrono::milliseconds kTurn{100};
+  constexpr double kUntilItIsListed = 0.3;
+  if (_queue.isLoaded()) return std::nullopt;
+  list();
+  const auto until = std::chrono::steady_clock::now() + kTurn;
+  while (const auto name = _backlog.next()) {
+    try {
+      const auto why = whyUnlisted();
+      if (why) dropUnread(*name, *why);
+      // It may have been kept since, and listed for that.
+      if (!why && !_queue.holds(name->order)) load(*name, each);
+    } catch (const std::bad_alloc&) {
+      _backlog.wasRead(false);
+      throw;
     }
-    if (!entry) continue;
-    support::SpoolPlace place = placeOf(*entry, 0);
-    place.bytes = static_cast<std::uint32_t>(found.bytes);
-    if (!_queue.addLoaded(place, http::addressOf(entry->url), entry->uid, entry->lastError)) {
-      _folder.remove(name);
-    } else if (const auto refused = refusalBeforeTry(*entry)) {
-      drop(name, *refused, &*entry);
-    }
+    _backlog.wasRead(true);
+    if (std::chrono::steady_clock::now() >= until) return 0;
   }
+  if (!_backlog.isDone()) return kUntilItIsListed;
+  dropUnlisted(std::nullopt);
   _queue.allLoaded();
   makeRoom();
+  return std::nullopt;
 }
 
-std::optional<Reason> PostSpool::refusalOf(const support::SpoolEntry& post) {
-  return _rules.refusal(post, _sections.load(), false);
+void PostSpool::dropUnlisted(std::optional<Reason> why) {
+  const Lock held(_mutex);
+  _unlisted = why;
 }
 
-// Each question is a log line where a storebag cannot be had.
-std::optional<Reason> PostSpool::refusalBeforeTry(const support::SpoolEntry& post) {
-  constexpr std::chrono::seconds kApart{30};
-  const auto now = std::chrono::steady_clock::now();
-  const auto [asked, isNew] = _asked.try_emplace(post.clientType(), now);
-  const bool fetch = isNew || asked->second + kApart <= now;
-  if (fetch) asked->second = now;
-  return _rules.refusal(post, _sections.load(), fetch);
+std::optional<Reason> PostSpool::whyUnlisted() {
+  const Lock held(_mutex);
+  return _unlisted;
+}
+
+void PostSpool::load(const Name& name, const Each& each) {
+  const support::SpoolFolder::Read found = read(name);
+  const auto& entry = found.entry;
+  const auto bytes = static_cast<std::uint32_t>(found.bytes);
+  if (found.torn) {
+    _counters.count(Reason::spool_torn);
+    logWarning("A post in the spool is torn, and removed: %s", support::textOf(name.id).c_str());
+    _removals.remove(name);
+  }
+  if (found.passes && !_queue.holds(name.order)) _queue.addUnread(name, bytes);
+  if (!entry && !found.passes) static_cast<void>(_queue.takeOut(name.order));
+  if (!entry) return;
+  support::SpoolPlace place = placeOf(*entry, 0);
+  place.bytes = bytes;
+  _queue.addLoaded(place, http::addressOf(entry->url), entry->uid, entry->lastError);
+  each(name, *entry);
+}
+
+void PostSpool::readAgain(const Each& each) {
+  for (const Name& name : _queue.unread()) load(name, each);
+}
+
+LeaveVerdict PostSpool::verdict(const support::SpoolEntry& post,
+                                const std::optional<ClientFacts>& facts) const {
+  const auto section = post.asksEntry ? _sections.known(post.clientType()) : nullptr;
+  return _rules.verdict(post, section.get(), facts);
+}
+
+LeaveVerdict PostSpool::verdictBeforeTry(const support::SpoolEntry& post,
+                                         const std::optional<ClientFacts>& facts) {
+  const bool asksSection = post.asksEntry && !post.namesHidden;
+  if (!asksSection || !_sections.isAwaited(post.clientType())) return verdict(post, facts);
+  const auto refused = _rules.ownersRefusal(post);
+  return {refused, !refused};
 }
 
 void PostSpool::begins(const Name& name) {
@@ -231,25 +323,32 @@ void PostSpool::begins(const Name& name) {
   if (const auto place = _queue.place(name.order, address)) _notes.again(notedPost(*place));
 }
 
+// A post that has arrived and whose file outlives a kill comes again with the same ID.
 void PostSpool::tried(const support::SpoolEntry& post, const http::HTTPResult& result) {
-  if (!result && result.error().kind == http::HTTPError::Kind::refused) {
-    const Reason why = result.error().refusal.value_or(Reason::refused_by_owner);
-    return drop({post.order, post.id}, why, &post);
+  const Name name{post.order, post.id};
+  const int tries = post.tries + triesOf(result);
+  const bool refused = !result && result.error().kind == http::HTTPError::Kind::refused;
+  if (refused) drop(name, result.error().refusal.value_or(Reason::refused_by_owner), &post);
+  const auto place = refused ? std::nullopt : _queue.tried(post.order, result);
+  if (!place) {  // dropped, now or meanwhile
+    if (tries > 0) _notes.record(post, tries, endOf(result));
+    return;
   }
-  const auto place = _queue.tried(post.order, result);
-  if (!place) return;
-  if (!result || isToBeKept(result))
-    return _notes.kept(notedPost(*place), outcomeOf(result), _queue.waitAt(place->address));
+  if (!result || isToBeKept(result)) {
+    _notes.kept(notedPost(*place), outcomeOf(result), _queue.waitAt(place->address));
+    return writeAgain(post);
+  }
   const int status = result.value().status;
   const Reason reason = verdictOfStatus(status).reason;
   _counters.eventTaken(post.events);
   _counters.count(reason, post.events);
+  _removals.remove(name);
   _notes.answered(notedPost(*place), reason, status);
-  _notes.record(post, place->tries, endOf(result));
+  _notes.record(post, tries, endOf(result));
 }
 
-// A post that has arrived and whose file outlives a kill comes again with the same ID.
-void PostSpool::filed(const support::SpoolEntry& post) {
+// With the number of its tries.
+void PostSpool::writeAgain(const support::SpoolEntry& post) {
   const Name name{post.order, post.id};
   SpoolQueue::AddressStatus address;
   if (const auto place = _queue.place(post.order, address)) {
@@ -260,14 +359,15 @@ void PostSpool::filed(const support::SpoolEntry& post) {
     if (_folder.rewrite(name, bytes)) _queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()));
   }
   // It may have been dropped meanwhile.
-  if (!_queue.holds(post.order)) _folder.remove(name);
+  if (!_queue.holds(post.order)) _removals.remove(name);
 }
 
 void PostSpool::dropExpired() {
-  const double last = platform::timevalToSeconds(_clock.now()) - _secondsKept;
-  if (last <= 0) return;
-  while (const auto name = _queue.olderThan(static_cast<std::uint64_t>(last * 1e6)))
-    drop(*name, Reason::spool_expired);
+  const auto amount = _queue.amount();
+  if (amount.posts == 0) return;
+  const double now = platform::timevalToSeconds(_clock.now());
+  const std::uint64_t last = _age.tooOldBefore(now, runningSeconds(), amount.oldest, _queue.lastOrder());
+  while (const auto name = _queue.olderThan(last)) drop(*name, Reason::spool_expired);
 }
 
 }  // namespace veltrad::backends

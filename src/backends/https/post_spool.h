@@ -3,26 +3,26 @@
 // by the disk writer's thread.
 #pragma once
 
-#include <atomic>
 #include <chrono>
 #include <cstdint>
 #include <functional>
-#include <future>
-#include <map>
 #include <memory>
 #include <optional>
 #include <string>
-#include <utility>
 #include <vector>
 
+#include "backends/https/spool_backlog.h"
 #include "backends/https/spool_notes.h"
 #include "backends/https/spool_queue.h"
+#include "backends/https/spool_removals.h"
 #include "backends/https/spool_rules.h"
+#include "backends/https/spool_sections.h"
 #include "base/mutex.h"
 #include "http/http_client.h"
 #include "platform/disk_writer.h"
 #include "platform/limited_line.h"
 #include "platform/memory_budget.h"
+#include "support/spool_age.h"
 #include "support/spool_entry.h"
 #include "support/spool_folder.h"
 
@@ -61,7 +61,7 @@ struct SpoolServices {
   platform::FateRing* fates = nullptr;
 };
 
-// Its 13 fields are the services, the parts of the spool, and who is told.
+// Its 15 fields are the services, the parts of the spool, and who is told.
 class PostSpool {
  public:
   using Name = support::SpoolFolder::Name;
@@ -80,65 +80,77 @@ class PostSpool {
   // A post that was not admitted.
   void keep(const std::shared_ptr<SpooledPost>& post);
 
-  // The sender: on its thread, but for tried().
+  // The sender's thread, where nothing else is said.
 
-  // Looks what an earlier daemon has left. Called once, before any post can be kept.
+  // Has what an earlier daemon has left looked at, unless that was done. Any thread; first called before any
+  // post can be kept.
   void list();
-  // Reads what was listed, and drops what may not leave, unless `stops` says so before.
-  void load(const std::function<bool()>& stops);
+  // Reads some of it, and gives each post that is kept to `each`. Returns the seconds until there may be more
+  // to read; nothing: all was read.
+  using Each = std::function<void(const Name& name, const support::SpoolEntry& post)>;
+  std::optional<double> loadSome(const Each& each);
+  // The same for what could not be read then.
+  void readAgain(const Each& each);
   // The post as it lies there. Any thread.
   support::SpoolFolder::Read read(const Name& name) const { return _folder.read(name); }
-  // Why the post may not leave. May wait for the download of a storebag, now and then.
-  std::optional<wire::Reason> refusalBeforeTry(const support::SpoolEntry& post);
-  // The same by what is known. Any thread.
-  std::optional<wire::Reason> refusalOf(const support::SpoolEntry& post);
-  // A try begins; it has ended so, on the HTTP thread, after which filed() follows on the sender's.
+  // Whether the post may leave by what is known of its storebag. Any thread.
+  LeaveVerdict verdict(const support::SpoolEntry& post, const std::optional<ClientFacts>& facts) const;
+  // The same, but that it waits while its storebag is being fetched, which this may begin.
+  LeaveVerdict verdictBeforeTry(const support::SpoolEntry& post, const std::optional<ClientFacts>& facts);
+  // A try begins; it has ended so, and the file is removed, or is told how often the post was tried.
   void begins(const Name& name);
   void tried(const support::SpoolEntry& post, const http::HTTPResult& result);
-  // Removes the file of a post that has left, or writes into it how often it was tried.
-  void filed(const support::SpoolEntry& post);
+  // Of a post that was dropped after so many tries; without any there is no record.
+  void recordUnsent(const support::SpoolEntry& post, int tries) const;
   void dropExpired();
 
-  // Removes a post and counts its events, unless it is gone. `post`: where it is at hand.
-  void drop(const Name& name, wire::Reason reason, const support::SpoolEntry* post = nullptr);
-  // Removes all, also what is being written, and drops what is under way if it fails. Returns how many posts.
+  // Removes a post and counts its events. False: it is gone. `post`: where it is at hand.
+  bool drop(const Name& name, wire::Reason reason, const support::SpoolEntry* post = nullptr);
+  // Removes all, also what was not read yet and what is being written, and drops what is under way if it
+  // fails. Returns how many posts.
   std::size_t empty(wire::Reason reason, Deadline deadline);
   // All of it leaves now, but for the pace. Returns how many posts that are.
   std::size_t sendNow();
   // Waits until all that was kept is on disk. False if the deadline passed first.
   bool drain(Deadline deadline);
 
-  // Set before the sender runs.
-  void setSections(SectionSource& sections) { _sections.store(&sections); }
   // Called whenever there may be something to send; null: nobody is.
   void setWaker(std::function<void()> waker);
 
   SpoolQueue& queue() { return _queue; }
+  SpoolSections& sections() { return _sections; }
+  SpoolRemovals& removals() { return _removals; }
   const SpoolRules& rules() const { return _rules; }
   const support::SpoolFolder& folder() const { return _folder; }
 
  private:
   void wake();
+  void dropUnlisted(std::optional<wire::Reason> why);
+  std::optional<wire::Reason> whyUnlisted();
   void file(const std::shared_ptr<SpooledPost>& post);
   void write(const SpooledPost& post);
+  bool keepOnDisk(const SpooledPost& post);
   void makeRoom();
+  void load(const Name& name, const Each& each);
+  void dropUnread(const Name& name, wire::Reason reason);
+  void writeAgain(const support::SpoolEntry& post);
 
   const platform::Clock& _clock;
   platform::Counters& _counters;
   SpoolRules _rules;
   const SpoolNotes _notes;
-  const double _secondsKept;
+  support::SpoolAge _age;
   const support::SpoolFolder _folder;
+  SpoolRemovals _removals;
   SpoolQueue _queue;
+  SpoolSections _sections;
+  SpoolBacklog _backlog;
   platform::LimitedLine _diskLine{"posts"};
-  std::atomic<SectionSource*> _sections{nullptr};
-  // What an earlier daemon has left.
-  std::future<std::vector<Name>> _listed;
-  // When the storebags of client types were asked for. The sender's thread.
-  std::map<std::int32_t, Deadline> _asked;
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::function<void()> _waker GUARDED_BY(_mutex);
+  // Why what is listed later is dropped: the spool was emptied before it was known what there is.
+  std::optional<wire::Reason> _unlisted GUARDED_BY(_mutex);
 
   // Last, because its destructor ends the writer's use of the others.
   platform::DiskWriter::Queue _jobs;

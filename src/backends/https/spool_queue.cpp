@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <utility>
 
 #include "backends/https/spool_verdicts.h"
 #include "platform/clock.h"
@@ -25,6 +26,10 @@ double jitter() {
   const unsigned number = bytes[0] | unsigned{bytes[1]} << 8 | unsigned{bytes[2]} << 16;
   return number / double{1u << 24};
 }
+
+// Of posts that could not be read yet.
+constexpr const char* kNoAddress = "";
+constexpr std::uint32_t kNoUser = 0xffff'ffff;
 
 double retryAfterOf(const http::HTTPResult& result) {
   return static_cast<double>((result ? result.value().retryAfter : result.error().retryAfter).count());
@@ -99,18 +104,39 @@ bool SpoolQueue::add(Place place, const std::string& address, std::uint32_t uid,
   return true;
 }
 
-bool SpoolQueue::addLoaded(Place place, const std::string& address, std::uint32_t uid,
+void SpoolQueue::addLoaded(Place place, const std::string& address, std::uint32_t uid,
                            const std::string& lastError) {
   const Lock held(_mutex);
-  if (_emptied > 0) return false;
-  _lastOrder = std::max(_lastOrder, place.name.order);
+  if (Place* unread = _index.find(place.name.order)) remove(*unread);
   place.address = numberOf(address);
   place.user = _index.userNumber(uid);
   place.state = State::waiting;
   _index.add(place);
+  _lastOrder = std::max(_lastOrder, place.name.order);
   SpoolWait& wait = _waits[place.address];
   if (!wait.failing()) wait.failed(steadyNow(), false, 0, jitter(), lastError);
-  return true;
+}
+
+void SpoolQueue::addUnread(const Name& name, std::uint32_t bytes) {
+  Place place;
+  place.name = name;
+  place.bytes = bytes;
+  place.state = State::unread;
+  const Lock held(_mutex);
+  place.address = numberOf(kNoAddress);
+  place.user = _index.userNumber(kNoUser);
+  _index.add(place);
+  _lastOrder = std::max(_lastOrder, name.order);
+}
+
+std::vector<SpoolQueue::Name> SpoolQueue::unread() const {
+  std::vector<Name> names;
+  const Lock held(_mutex);
+  _index.visit(0, [&names](const Place& place) {
+    if (place.state == State::unread) names.push_back(place.name);
+    return true;
+  });
+  return names;
 }
 
 void SpoolQueue::allLoaded() {
@@ -173,10 +199,16 @@ std::optional<SpoolQueue::Name> SpoolQueue::olderThan(std::uint64_t order) const
   return place && place->name.order < order ? std::optional(place->name) : std::nullopt;
 }
 
+std::uint64_t SpoolQueue::lastOrder() const {
+  const Lock held(_mutex);
+  return _lastOrder;
+}
+
 std::vector<SpoolQueue::Name> SpoolQueue::takeDue(double& next) {
   constexpr double kLongest = 3600;
   std::vector<Name> due;
   const Lock held(_mutex);
+  due.reserve(_waits.size());  // first, because it may find no memory
   const double now = steadyNow();
   next = kLongest;
   const auto isBlocked = [this](const Place& place) REQUIRES(_mutex) { return blocked(place); };
@@ -197,21 +229,33 @@ std::vector<SpoolQueue::Name> SpoolQueue::takeDue(double& next) {
 }
 
 std::optional<SpoolQueue::Place> SpoolQueue::tried(std::uint64_t order, const http::HTTPResult& result) {
+  constexpr double kUntilThereIsRoom = 1;
   const bool settles = result && !isToBeKept(result);
+  std::string outcome = outcomeOf(result);
   const Lock held(_mutex);
   Place* found = _index.find(order);
   if (!found) return std::nullopt;
-  if (result || result.error().begun) ++found->tries;
+  found->tries = static_cast<std::uint16_t>(std::min(0xffff, found->tries + triesOf(result)));
   found->state = State::waiting;
   const Place place = *found;
   SpoolWait& wait = _waits[place.address];
   if (settles) {
     wait.succeeded();
     remove(*found);
-  } else if (result || result.error().kind != http::HTTPError::Kind::stopping) {
-    wait.failed(steadyNow(), true, retryAfterOf(result), jitter(), outcomeOf(result));
+  } else if (tellsOfServer(result)) {
+    wait.failed(steadyNow(), true, retryAfterOf(result), jitter(), std::move(outcome));
+  } else {
+    wait.postponed(steadyNow() + kUntilThereIsRoom);
   }
   return place;
+}
+
+void SpoolQueue::putBack(std::uint64_t order, double seconds) {
+  const Lock held(_mutex);
+  Place* found = _index.find(order);
+  if (!found || found->state != State::sending) return;
+  found->state = State::waiting;
+  _waits[found->address].postponed(steadyNow() + seconds);
 }
 
 void SpoolQueue::woken() {
@@ -273,7 +317,8 @@ std::vector<SpoolQueue::AddressStatus> SpoolQueue::addresses() const {
   std::vector<AddressStatus> all;
   const Lock held(_mutex);
   for (std::uint16_t address = 0; address < _waits.size(); ++address) {
-    if (_index.postsAt(address) > 0) all.push_back(statusOf(address));
+    if (_index.postsAt(address) > 0 && _index.address(address) != kNoAddress)
+      all.push_back(statusOf(address));
   }
   return all;
 }

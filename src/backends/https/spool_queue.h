@@ -50,14 +50,18 @@ class SpoolQueue {
   Admission admit(const std::string& address, std::uint32_t connection);
   // It has ended, and the server has given an answer that is no reason to keep it; or there is no answer.
   void landed(std::uint64_t order, const std::string& address, bool answered);
-  // It has ended so that it is kept.
+  // It has ended so that it is kept, and tells of its server.
   void failed(const std::string& address, const http::HTTPResult& result);
   // Takes a place in state `writing`, so that later ones of its connection queue behind it. False: the queue
   // has been emptied since it was admitted.
   bool add(Place place, const std::string& address, std::uint32_t uid, std::uint64_t emptied);
-  // What an earlier daemon has left. False: the queue has been emptied since.
-  bool addLoaded(Place place, const std::string& address, std::uint32_t uid, const std::string& lastError);
+  // What an earlier daemon has left, also in the place of one that could not be read before.
+  void addLoaded(Place place, const std::string& address, std::uint32_t uid, const std::string& lastError);
+  // One of these that cannot be read yet. It takes its bytes, and is not sent.
+  void addUnread(const Name& name, std::uint32_t bytes);
+  std::vector<Name> unread() const;
   void allLoaded();
+  bool isLoaded() const { return waitUntilLoaded({}); }
   // False if the deadline passed first.
   bool waitUntilLoaded(std::chrono::steady_clock::time_point deadline) const;
 
@@ -72,12 +76,16 @@ class SpoolQueue {
   std::optional<Name> excess(support::SpoolIndex::Excess& why) const;
   // The oldest, if it was made before.
   std::optional<Name> olderThan(std::uint64_t order) const;
+  // Of the newest post that was ever made.
+  std::uint64_t lastOrder() const;
 
   // Posts that leave now. `next`: when to ask again, in seconds from now.
   std::vector<Name> takeDue(double& next);
   // One of these has ended so. Returns it as it is now; nothing: it was taken out meanwhile. It is taken out
   // if it is not kept.
   std::optional<Place> tried(std::uint64_t order, const http::HTTPResult& result);
+  // One of these was not tried, and its address waits for so many seconds.
+  void putBack(std::uint64_t order, double seconds);
   // The network may be there again.
   void woken();
   // All leave now, but for the pace. Returns how many posts that are.

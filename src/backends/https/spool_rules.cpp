@@ -2,7 +2,8 @@
 // Reads what the verdict needs.
 #include "backends/https/spool_rules.h"
 
-#include "backends/https/spool_verdicts.h"
+#include <utility>
+
 #include "config/owner_gate.h"
 #include "config/preference_keys.h"
 #include "platform/locale.h"
@@ -12,12 +13,28 @@
 
 namespace veltrad::backends {
 
-std::optional<wire::Reason> SpoolRules::refusal(const support::SpoolEntry& post, SectionSource* sections,
-                                                bool fetch) {
-  const auto section = sections && post.asksEntry ? sections->sectionFor(post.clientType(), fetch) : nullptr;
-  const ClientFacts facts{word({}).consent, _sources.locale.countryCode(),
-                          _sources.device.deviceName().value_or(""), _sources.device.deviceProductType(), 0};
-  return refusalToLeave(post, *_sources.gate.word(), section.get(), facts);
+std::optional<bool> SpoolRules::consent() const {
+  const auto found =
+      _sources.preferences.lookUp(platform::kVeltraPreferenceDomain, config::preference::kConsent);
+  if (!found) return std::nullopt;
+  return found.value() && found.value()->toBoolean().value_or(false);
+}
+
+std::optional<ClientFacts> SpoolRules::facts() const {
+  const auto given = consent();
+  auto device = _sources.device.nameAndType();
+  if (!given || !device) return std::nullopt;
+  return ClientFacts{*given, _sources.locale.countryCode(), std::move(device->name).value_or(""),
+                     std::move(device->productType), 0};
+}
+
+LeaveVerdict SpoolRules::verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
+                                 const std::optional<ClientFacts>& facts) const {
+  return verdictOnLeaving(post, *_sources.gate.word(), section, facts);
+}
+
+std::optional<wire::Reason> SpoolRules::ownersRefusal(const support::SpoolEntry& post) const {
+  return refusalByOwner(post, *_sources.gate.word());
 }
 
 std::optional<wire::Reason> SpoolRules::refusalOfAll() const {
@@ -25,10 +42,7 @@ std::optional<wire::Reason> SpoolRules::refusalOfAll() const {
 }
 
 SpoolRules::Word SpoolRules::word(const Word& before) const {
-  const auto found =
-      _sources.preferences.lookUp(platform::kVeltraPreferenceDomain, config::preference::kConsent);
-  const bool consent = found ? found.value() && found.value()->toBoolean().value_or(false) : before.consent;
-  return {_sources.gate.turn(), consent};
+  return {_sources.gate.turn(), consent().value_or(before.consent)};
 }
 
 }  // namespace veltrad::backends

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks what decides whether a kept post may leave: the owner, the storebag in force, the machine. Any thread.
+// Asks what decides whether a kept post may leave: the owner, the machine, and a section. Any thread.
 #pragma once
 
 #include <cstdint>
 #include <memory>
 #include <optional>
 
+#include "backends/https/spool_verdicts.h"
 #include "config/storebag_content.h"
 #include "wire/reasons.h"
 
@@ -25,14 +26,6 @@ struct SpoolEntry;
 
 namespace veltrad::backends {
 
-class SectionSource {
- public:
-  virtual ~SectionSource() = default;
-  // The section for a client type; null: there is none. `fetch`: as for a session, which may wait for a
-  // download; else only what is known.
-  virtual std::shared_ptr<const config::StorebagSection> sectionFor(std::int32_t clientType, bool fetch) = 0;
-};
-
 class SpoolRules {
  public:
   struct Sources {
@@ -44,8 +37,12 @@ class SpoolRules {
   // The sources outlive it.
   explicit SpoolRules(const Sources& sources) : _sources(sources) {}
 
-  // Why the post may not leave. Without `sections` it is decided as if none could be had.
-  std::optional<wire::Reason> refusal(const support::SpoolEntry& post, SectionSource* sections, bool fetch);
+  // What the machine says, for as many posts as are asked for at once; nothing: it cannot be read just now.
+  std::optional<ClientFacts> facts() const;
+  // As in spool_verdicts.h, by the owner's word of now.
+  LeaveVerdict verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
+                       const std::optional<ClientFacts>& facts) const;
+  std::optional<wire::Reason> ownersRefusal(const support::SpoolEntry& post) const;
   // Why nothing may leave.
   std::optional<wire::Reason> refusalOfAll() const;
 
@@ -58,6 +55,9 @@ class SpoolRules {
   Word word(const Word& before) const;
 
  private:
+  // Nothing: it cannot be read just now.
+  std::optional<bool> consent() const;
+
   const Sources _sources;
 };
 

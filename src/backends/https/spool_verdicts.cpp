@@ -31,14 +31,27 @@ std::string outcomeOf(const http::HTTPResult& result) {
   return result ? fmt::format("HTTP {}", result.value().status) : result.error().description;
 }
 
-std::optional<Reason> refusalToLeave(const support::SpoolEntry& post, const config::OwnersWord& word,
-                                     const config::StorebagSection* section, const ClientFacts& facts) {
-  const std::string backend = post.text("backend");
-  if (auto refused = word.refusalFor(backend, {http::hostName(post.url)})) return refused;
-  if (!post.asksEntry) return std::nullopt;
+bool tellsOfServer(const http::HTTPResult& result) {
+  return result || result.error().kind == http::HTTPError::Kind::transport ||
+         result.error().kind == http::HTTPError::Kind::tooLarge;
+}
+
+int triesOf(const http::HTTPResult& result) {
+  if (result) return std::max(1, result.value().transmissions);
+  const http::HTTPError& error = result.error();
+  return error.begun && error.refusal != Reason::over_daily_limit ? std::max(1, error.transmissions) : 0;
+}
+
+std::optional<Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnersWord& word) {
+  return word.refusalFor(post.text("backend"), {http::hostName(post.url)});
+}
+
+namespace {
+std::optional<Reason> refusalByEntry(const support::SpoolEntry& post, const config::StorebagSection* section,
+                                     const ClientFacts& facts) {
   // Without the names that choose the entry, too, consent alone can be asked.
   if (!section || post.namesHidden) return facts.consent ? std::nullopt : std::optional(Reason::no_consent);
-  const auto found = section->backends.find(backend);
+  const auto found = section->backends.find(post.text("backend"));
   if (found == section->backends.end() || !found->second) return Reason::no_entry;
   const auto* profile = std::get_if<config::HTTPSPostProfile>(found->second.get());
   if (!profile || !profile->clients) return Reason::no_entry;
@@ -51,6 +64,16 @@ std::optional<Reason> refusalToLeave(const support::SpoolEntry& post, const conf
     return matchClientNameAndServiceID(candidate, name("client"), name("service"));
   });
   return entry == clients.end() ? Reason::no_entry : refusalBeforeSampling(*entry, facts);
+}
+}  // namespace
+
+LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnersWord& word,
+                              const config::StorebagSection* section,
+                              const std::optional<ClientFacts>& facts) {
+  if (const auto refused = refusalByOwner(post, word)) return {refused, false};
+  if (!post.asksEntry) return {};
+  if (!facts) return {std::nullopt, true};
+  return {refusalByEntry(post, section, *facts), false};
 }
 
 Reason countedFromSpool(Reason why) {

@@ -25,12 +25,30 @@ namespace veltrad::backends {
 bool isToBeKept(const http::HTTPResult& result);
 // "HTTP 503", or the transport's text.
 std::string outcomeOf(const http::HTTPResult& result);
+// Whether it says anything of the server: what this end could not begin, or gave up, does not.
+bool tellsOfServer(const http::HTTPResult& result);
+// How often the post was tried, with libcurl's own repeats on a kept connection. One that found no server was
+// tried, too; one that the day's limit refused was not.
+int triesOf(const http::HTTPResult& result);
 
-// Why a post may not leave any more; nothing: it may. The owner's word stands above all; then decides the
-// client entry of the section that is in force, or, without a section, consent. Sampling is not drawn anew.
-// Of `facts`, the sampling factor is not used. `section` may be null.
-std::optional<wire::Reason> refusalToLeave(const support::SpoolEntry& post, const config::OwnersWord& word,
-                                           const config::StorebagSection* section, const ClientFacts& facts);
+// Whether a kept post may leave.
+struct LeaveVerdict {
+  // Why it may not.
+  std::optional<wire::Reason> refusal;
+  // It cannot be told just now, and the post waits.
+  bool waits = false;
+
+  bool mayLeave() const { return !refusal && !waits; }
+};
+
+// The owner's word stands above all.
+std::optional<wire::Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnersWord& word);
+// Then decides the client entry of the section that is in force, or, without a section (null), consent.
+// Sampling is not drawn anew, and of `facts` the factor is not used. Without `facts`, which cannot be read
+// just now, a post waits if they decide.
+LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnersWord& word,
+                              const config::StorebagSection* section,
+                              const std::optional<ClientFacts>& facts);
 
 // Under which an event is counted that leaves the spool unsent for this reason.
 wire::Reason countedFromSpool(wire::Reason why);

@@ -35,8 +35,14 @@ void SpoolWait::emptied() {
   _nextTry = 0;
 }
 
+// What was late is caught up with, so that the pace is kept; what was not used is gone.
 void SpoolWait::left(double now) {
-  _nextLeave = now + 1 / _pace->postsPerSecond;
+  const double apart = 1 / _pace->postsPerSecond;
+  _nextLeave = now - _nextLeave < apart ? _nextLeave + apart : now + apart;
+}
+
+void SpoolWait::postponed(double until) {
+  _nextLeave = std::max(_nextLeave, until);
 }
 
 void SpoolWait::woken(double now, double draw) {

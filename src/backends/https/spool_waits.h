@@ -35,6 +35,8 @@ class SpoolWait {
   void succeeded();
   // A post has been begun.
   void left(double now);
+  // None leaves before then, whatever the server does: this end cannot send just now.
+  void postponed(double until);
   // No post is left. What the server asks for stays.
   void emptied();
   // A route has come, or the machine has woken.

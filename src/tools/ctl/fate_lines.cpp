@@ -123,6 +123,7 @@ Dictionary lineOfMessage(const support::ToldMessage& message) {
       {"category", valueIfKnown(entry.known, Message::categoryKnown, unsigned{entry.category})},
       {"type", valueIfKnown(entry.known, Message::typeKnown, unsigned{entry.type})},
       {"flag", entry.flag},
+      {"aggregatedTo", valueOrNull(message.aggregatedTo)},
       {"reason", reasonOrNull(wire::reasonIn(entry.reason))},
       {"storebag", nullValue()}};
   if (session.storebag) {
@@ -140,7 +141,6 @@ Dictionary lineOfFates(const support::MessageFates& fates) {
   for (const auto& [name, fate] : fates.backends)
     backends.emplace_back(name, lineOfBackend(fate, fates.road));
   line.set("backends", Dictionary::fromEntries(std::move(backends)));
-  line.set("aggregatedTo", valueOrNull(fates.aggregatedTo));
   return line;
 }
 

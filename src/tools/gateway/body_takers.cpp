@@ -19,8 +19,6 @@ namespace {
 
 constexpr PropertyListLimits kLogDataLimits{32u << 20, 64, 500'000, 32u << 20};
 constexpr std::size_t kLocationDigits = 32;
-// What a file keeps in memory besides what the publisher holds.
-constexpr std::uint64_t kFileBytes = 2 * kPieceBytes;
 
 using Answering = std::function<void(Answer)>;
 
@@ -30,14 +28,26 @@ void identify(Message& message, const Wanted& wanted, std::string digest) {
   if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
 }
 
+// Servers look for a header's name in the whole text of all, so no other one may hold what begins like
+// theirs.
+std::string headerText(const Dictionary& fields) {
+  std::string text = formats::writeJSON(fields);
+  for (std::size_t at = text.find("Nats-"); at != std::string::npos; at = text.find("Nats-", at))
+    text.replace(at, 1, "\\u004e");
+  return text;
+}
+
+const char* reasonOf(Outcome outcome) {
+  return outcome == Outcome::late ? "held_too_long" : "no_room";
+}
+
 // What becomes of the request: `answer` if the stream has taken the message.
 Publisher::Completion answeringWith(const DoorServices& services, Answer answer,
                                     std::atomic<std::uint64_t>& counter, std::uint64_t events,
                                     Answering answering) {
   return [&services, answer = std::move(answer), &counter, events,
           answering = std::move(answering)](Outcome outcome) {
-    if (outcome != Outcome::taken)
-      return answering(services.refusals.busy(outcome == Outcome::late ? "held_too_long" : "no_room"));
+    if (outcome != Outcome::taken) return answering(services.refusals.busy(reasonOf(outcome)));
     counter.fetch_add(1, std::memory_order_relaxed);
     services.metrics.events.fetch_add(events, std::memory_order_relaxed);
     answering(answer);
@@ -46,12 +56,12 @@ Publisher::Completion answeringWith(const DoorServices& services, Answer answer,
 
 class EventsTaker final : public BodyTaker {
  public:
-  EventsTaker(const DoorServices& services, Wanted wanted)
+  EventsTaker(const DoorServices& services, Wanted wanted, Charge charge)
       : _services(services),
         _wanted(std::move(wanted)),
-        _body(services, _wanted.packed, services.bounds.events) {}
+        _body(services, std::move(charge), _wanted.packed, services.bounds.events) {}
 
-  std::optional<Answer> take(std::string_view bytes) override { return _body.add(bytes); }
+  std::optional<Answer> take(std::string_view& bytes) override { return _body.add(bytes); }
   bool hasRoom(std::function<void()>) override { return true; }
 
   void finish(Answering answering) override {
@@ -63,6 +73,7 @@ class EventsTaker final : public BodyTaker {
     identify(message, _wanted, digestOf(_wanted.path, _body.text()));
     if (!_wanted.via.empty()) message.headers.emplace_back(header::kVia, _wanted.via);
     message.body = _body.take();
+    if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
     publishWhole(_services.publisher, std::move(message),
                  answeringWith(_services, Answer{}, _services.metrics.posts, count, std::move(answering)));
   }
@@ -75,31 +86,44 @@ class EventsTaker final : public BodyTaker {
 
 class LogDataTaker final : public BodyTaker {
  public:
-  LogDataTaker(const DoorServices& services, Wanted wanted)
+  LogDataTaker(const DoorServices& services, Wanted wanted, Charge charge)
       : _services(services),
         _wanted(std::move(wanted)),
-        _body(services, _wanted.packed, services.bounds.logData) {}
+        _body(services, std::move(charge), _wanted.packed, services.bounds.logData) {}
 
-  std::optional<Answer> take(std::string_view bytes) override { return _body.add(bytes); }
+  std::optional<Answer> take(std::string_view& bytes) override { return _body.add(bytes); }
   bool hasRoom(std::function<void()>) override { return true; }
 
   void finish(Answering answering) override {
     if (auto refusal = _body.end()) return answering(std::move(*refusal));
-    const auto list = formats::parsePropertyList(_body.text(), kLogDataLimits);
-    if (!list)
-      return answering(_services.refusals.malformed("log_data", list.error().description(), _body.text()));
-    if (!list.value().asArray())
-      return answering(_services.refusals.malformed("log_data", "it is no array", _body.text()));
+    auto text = json();
+    if (!text) return answering(std::move(text.error()));
     std::string digest = digestOf(_wanted.path, _body.text());
     const std::string location = "/logdata/" + digest.substr(0, kLocationDigits);
-    Message message{subject::kLogData, "", {{header::kLocation, location}}, formats::writeJSON(list.value())};
+    Message message{subject::kLogData, "", {{header::kLocation, location}}, std::move(text).value()};
     identify(message, _wanted, std::move(digest));
+    if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
     publishWhole(_services.publisher, std::move(message),
                  answeringWith(_services, Answer{200, location, "text/plain", {}}, _services.metrics.logData,
                                0, std::move(answering)));
   }
 
  private:
+  // As JSON a list can be many times as long, so more than the bound is never written.
+  Result<std::string, Answer> json() {
+    const auto list = formats::parsePropertyList(_body.text(), kLogDataLimits);
+    if (!list)
+      return Failure{_services.refusals.malformed("log_data", list.error().description(), _body.text())};
+    if (!list.value().asArray())
+      return Failure{_services.refusals.malformed("log_data", "it is no array", _body.text())};
+    auto text = formats::excerptOfJSON(list.value(), _services.bounds.logData);
+    if (text.leftOut > 0)
+      return Failure{_services.refusals.answer(
+          {413, "too_large", fmt::format("as JSON it has more than {} bytes", _services.bounds.logData)})};
+    text.text.shrink_to_fit();
+    return std::move(text.text);
+  }
+
   const DoorServices& _services;
   const Wanted _wanted;
   ReceivedBody _body;
@@ -109,30 +133,32 @@ class LogDataTaker final : public BodyTaker {
 // it comes into the tables.
 class FileTaker final : public BodyTaker {
  public:
-  FileTaker(const DoorServices& services, Wanted wanted)
+  FileTaker(const DoorServices& services, Wanted wanted, Charge charge)
       : _services(services),
         _wanted(std::move(wanted)),
+        _charge(std::move(charge)),
         _gunzip(services.bounds.unpackedFile),
-        _pieces(services.publisher),
-        _charged(services.budget.take(kFileBytes)) {
+        _pieces(services.publisher) {
     _message.add(_wanted.path);
-  }
-  ~FileTaker() override {
-    if (_charged) _services.budget.give(kFileBytes);
+    // A content that begins like the end of another path is another file.
+    _message.add(std::string_view("", 1));
   }
 
-  std::optional<Answer> take(std::string_view bytes) override {
-    if (!_charged) return _services.refusals.busy("no_room");
-    _received += bytes.size();
+  std::optional<Answer> take(std::string_view& bytes) override {
+    if (const Outcome pieces = _pieces.outcome(); pieces != Outcome::taken)
+      return _services.refusals.busy(reasonOf(pieces));
+    std::string_view unpacked = bytes;
+    const auto state = _gunzip.add(bytes, [this](std::string_view content) {
+      _content.add(content);
+      if (_wanted.postID.empty()) _message.add(content);
+    });
+    unpacked.remove_suffix(bytes.size());
+    _received += unpacked.size();
     if (_received > _services.bounds.packedFile)
       return _services.refusals.answer({413, "too_large", "the file is too large"});
-    const auto state = _gunzip.add(bytes, [this](std::string_view unpacked) {
-      _content.add(unpacked);
-      _message.add(unpacked);
-    });
     if (state != support::Gunzip::State::open && state != support::Gunzip::State::ended)
-      return refused(state, bytes);
-    _pieces.add(bytes);
+      return refused(state, unpacked);
+    _pieces.add(unpacked);
     return std::nullopt;
   }
   bool hasRoom(std::function<void()> resume) override { return _pieces.hasRoom(std::move(resume)); }
@@ -142,7 +168,7 @@ class FileTaker final : public BodyTaker {
     const Dictionary file{{"uuid", parameter("uuid")},         {"sequence", parameter("sequence")},
                           {"filename", parameter("filename")}, {"description", parameter("description")},
                           {"sha256", _content.hexDigits()},    {"bytes", _gunzip.unpackedBytes()}};
-    Message message{subject::kFiles, "", {{header::kFile, formats::writeJSON(file)}}, {}};
+    Message message{subject::kFiles, "", {{header::kFile, headerText(file)}}, {}};
     identify(message, _wanted, _message.hexDigits());
     _pieces.commit(std::move(message),
                    answeringWith(_services, Answer{200, "{\"success\":true}", "application/json", {}},
@@ -163,24 +189,24 @@ class FileTaker final : public BodyTaker {
 
   const DoorServices& _services;
   const Wanted _wanted;
+  const Charge _charge;
   support::Gunzip _gunzip;
   Digest _content;
   Digest _message;
   PieceWriter _pieces;
-  const bool _charged;
   std::uint64_t _received = 0;
 };
 
 }  // namespace
 
-std::unique_ptr<BodyTaker> takeEvents(const DoorServices& services, Wanted wanted) {
-  return std::make_unique<EventsTaker>(services, std::move(wanted));
+std::unique_ptr<BodyTaker> takeEvents(const DoorServices& services, Wanted wanted, Charge charge) {
+  return std::make_unique<EventsTaker>(services, std::move(wanted), std::move(charge));
 }
-std::unique_ptr<BodyTaker> takeFile(const DoorServices& services, Wanted wanted) {
-  return std::make_unique<FileTaker>(services, std::move(wanted));
+std::unique_ptr<BodyTaker> takeFile(const DoorServices& services, Wanted wanted, Charge charge) {
+  return std::make_unique<FileTaker>(services, std::move(wanted), std::move(charge));
 }
-std::unique_ptr<BodyTaker> takeLogData(const DoorServices& services, Wanted wanted) {
-  return std::make_unique<LogDataTaker>(services, std::move(wanted));
+std::unique_ptr<BodyTaker> takeLogData(const DoorServices& services, Wanted wanted, Charge charge) {
+  return std::make_unique<LogDataTaker>(services, std::move(wanted), std::move(charge));
 }
 
 }  // namespace veltrad::gateway

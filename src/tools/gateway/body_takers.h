@@ -8,11 +8,12 @@
 
 namespace veltrad::gateway {
 
+// `charge` has what the body is charged at first.
 // An envelope: 200 without a body.
-std::unique_ptr<BodyTaker> takeEvents(const DoorServices& services, Wanted wanted);
+std::unique_ptr<BodyTaker> takeEvents(const DoorServices& services, Wanted wanted, Charge charge);
 // A gzip stream, which is handed on as it comes: 200 and {"success":true}.
-std::unique_ptr<BodyTaker> takeFile(const DoorServices& services, Wanted wanted);
+std::unique_ptr<BodyTaker> takeFile(const DoorServices& services, Wanted wanted, Charge charge);
 // A property list of an array: 200 and the place where it is said to be.
-std::unique_ptr<BodyTaker> takeLogData(const DoorServices& services, Wanted wanted);
+std::unique_ptr<BodyTaker> takeLogData(const DoorServices& services, Wanted wanted, Charge charge);
 
 }  // namespace veltrad::gateway

@@ -2,6 +2,8 @@
 // Mends escapes in place, because U+FFFD takes as many characters as what it replaces.
 #include "gateway/clean_json.h"
 
+#include <fmt/format.h>
+
 #include <charconv>
 
 #include "base/text.h"
@@ -12,6 +14,22 @@ namespace veltrad::gateway {
 namespace {
 
 constexpr std::size_t kEscapeLength = 6;
+
+// At least as many as there are, without parsing.
+std::size_t valuesIn(std::string_view text) {
+  std::size_t values = 1;
+  bool inText = false;
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    const char c = text[at];
+    if (inText && c == '\\')
+      ++at;
+    else if (c == '"')
+      inText = !inText;
+    else if (!inText && (c == ',' || c == '[' || c == '{'))
+      ++values;
+  }
+  return values;
+}
 
 // The number of the escape \uXXXX at `at`; -1 if there is none.
 int escapedUnit(std::string_view text, std::size_t at) {
@@ -49,6 +67,8 @@ std::string withWholeCharacters(std::string text) {
 
 Result<Value, std::string> parseCleanJSON(std::string text) {
   if (!isUTF8(text)) return Failure{std::string("it is not UTF-8")};
+  if (text.size() > kMostValues && valuesIn(text) > kMostValues)
+    return Failure{fmt::format("it has more than {} values", kMostValues)};
   text = withWholeCharacters(std::move(text));
   auto value = formats::parseJSON(text);
   if (!value) return Failure{std::move(value.error().detail)};

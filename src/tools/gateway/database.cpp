@@ -43,9 +43,14 @@ void Database::Close::operator()(pg_conn* connection) const {
 
 Result<std::unique_ptr<Database>, StoreError> Database::open(const std::string& dsn) {
   // What the DSN says counts more than what stands before it.
-  const char* names[] = {"connect_timeout",  "application_name", "keepalives_idle",
-                         "tcp_user_timeout", "dbname",           nullptr};
-  const char* values[] = {"10", "veltra-gateway drain", "10", "20000", dsn.c_str(), nullptr};
+  const char* names[] = {"connect_timeout",
+                         "application_name",
+                         "keepalives_idle",
+                         "tcp_user_timeout",
+                         "client_encoding",
+                         "dbname",
+                         nullptr};
+  const char* values[] = {"10", "veltra-gateway drain", "10", "20000", "UTF8", dsn.c_str(), nullptr};
   Connection connection(PQconnectdbParams(names, values, 1));
   if (!connection || PQstatus(connection.get()) != CONNECTION_OK)
     return Failure{StoreError{StoreError::Kind::passing, oneLine(PQerrorMessage(connection.get()))}};

@@ -8,11 +8,14 @@
 #include <sys/socket.h>
 
 #include <charconv>
+#include <cstdint>
 #include <cstring>
+#include <utility>
 
 #include "config/client_types.h"
 #include "formats/json.h"
 #include "gateway/digest.h"
+#include "platform/log.h"
 #include "tools/dashboard_packet.h"
 
 namespace veltrad::gateway {
@@ -47,11 +50,24 @@ const char* faultName(std::string_view datagram) {
   return problem->find("kind") == std::string::npos ? "wrong_length" : "wrong_kind";
 }
 
-// Room for one address of the machine in a message's control part.
+// Room in a message's control part for one address of the machine, and for the number of datagrams that the
+// kernel had no room for.
 union Control {
   cmsghdr aligned;
-  char room[CMSG_SPACE(sizeof(in_pktinfo))];
+  char room[CMSG_SPACE(sizeof(in_pktinfo)) + CMSG_SPACE(sizeof(std::uint32_t))];
 };
+
+// Asks for more than net.core.rmem_max, which takes a right that few have, and then for as much as it allows.
+void enlargeReceiveBuffer(int socket) {
+  if (::setsockopt(socket, SOL_SOCKET, SO_RCVBUFFORCE, &kReceiveBytes, sizeof kReceiveBytes) == 0) return;
+  ::setsockopt(socket, SOL_SOCKET, SO_RCVBUF, &kReceiveBytes, sizeof kReceiveBytes);
+  int bytes = 0;
+  socklen_t length = sizeof bytes;
+  // The kernel says twice what it was asked for.
+  if (::getsockopt(socket, SOL_SOCKET, SO_RCVBUF, &bytes, &length) == 0 && bytes < 2 * kReceiveBytes)
+    logWarning("datagrams: the receive buffer has %d bytes; net.core.rmem_max should be at least %d",
+               bytes / 2, kReceiveBytes);
+}
 
 }  // namespace
 
@@ -59,7 +75,7 @@ Message messageOfDatagram(std::string_view datagram) {
   const Dictionary packet = tools::fieldsOfPacket(datagram);
   const auto number = [&packet](const char* key) { return packet.uint32(key).value_or(0); };
   const char* sender = config::senderCodeForComponentType(static_cast<std::int32_t>(number("componentType")));
-  const Dictionary fields{
+  Dictionary fields{
       {"deviceID", *packet.find("deviceID")},
       {"sender", sender ? sender : std::to_string(number("componentType"))},
       {"sessionID", number("sessionID")},
@@ -69,8 +85,10 @@ Message messageOfDatagram(std::string_view datagram) {
       {"eventNumber", number("eventID")},
       {"time", number("seconds") + number("timeFraction") * 4 / 1000.0},
       {"text", *packet.find("text")},
-      {"fields", *packet.find("payload")},
   };
+  const Dictionary& items = *packet.dictionary("payload");
+  // Such an object stands for a date or data, which datagrams do not have.
+  if (items.size() != 1 || !(items.contains("$date") || items.contains("$data"))) fields.set("fields", items);
   return {subject::kDatagrams, digestOf("/dashboard", datagram), {}, formats::writeJSON(fields)};
 }
 
@@ -88,7 +106,8 @@ Result<std::string, std::string> DatagramDoor::start(const std::string& text) {
       ::bind(socket, reinterpret_cast<sockaddr*>(&*address), length) != 0 ||
       ::getsockname(socket, reinterpret_cast<sockaddr*>(&*address), &length) != 0)
     return Failure{text + ": " + std::strerror(errno)};
-  ::setsockopt(socket, SOL_SOCKET, SO_RCVBUF, &kReceiveBytes, sizeof kReceiveBytes);
+  ::setsockopt(socket, SOL_SOCKET, SO_RXQ_OVFL, &yes, sizeof yes);
+  enlargeReceiveBuffer(socket);
   if (!_thread.start("datagrams", kDatagramStackBytes, [this] { run(); }))
     return Failure{std::string("a thread cannot be started")};
   return text.substr(0, text.rfind(':') + 1) + std::to_string(ntohs(address->sin_port));
@@ -125,10 +144,15 @@ bool DatagramDoor::receive(char* room, std::size_t size) {
   const ssize_t count = ::recvmsg(_socket->descriptor.get(), &message, MSG_DONTWAIT);
   if (count < 0) return false;
   for (cmsghdr* head = CMSG_FIRSTHDR(&message); head; head = CMSG_NXTHDR(&message, head)) {
-    if (head->cmsg_level != IPPROTO_IP || head->cmsg_type != IP_PKTINFO) continue;
-    in_pktinfo info{};
-    std::memcpy(&info, CMSG_DATA(head), sizeof info);
-    sender.at = info.ipi_addr;
+    if (head->cmsg_level == IPPROTO_IP && head->cmsg_type == IP_PKTINFO) {
+      in_pktinfo info{};
+      std::memcpy(&info, CMSG_DATA(head), sizeof info);
+      sender.at = info.ipi_addr;
+    } else if (head->cmsg_level == SOL_SOCKET && head->cmsg_type == SO_RXQ_OVFL) {
+      std::uint32_t dropped = 0;
+      std::memcpy(&dropped, CMSG_DATA(head), sizeof dropped);
+      _metrics.datagrams.add("dropped", dropped - std::exchange(_dropped, dropped));
+    }
   }
   handle(sender, {room, static_cast<std::size_t>(count)});
   return true;
@@ -160,7 +184,7 @@ void DatagramDoor::acknowledge(const Socket& socket, const Sender& sender, std::
   message.msg_iov = &part;
   message.msg_iovlen = 1;
   message.msg_control = control.room;
-  message.msg_controllen = sizeof control.room;
+  message.msg_controllen = CMSG_SPACE(sizeof(in_pktinfo));
   cmsghdr* head = CMSG_FIRSTHDR(&message);
   head->cmsg_level = IPPROTO_IP;
   head->cmsg_type = IP_PKTINFO;

@@ -53,6 +53,8 @@ class DatagramDoor {
   Metrics& _metrics;
   std::shared_ptr<Socket> _socket = std::make_shared<Socket>();
   FileDescriptor _stopping;
+  // By the kernel, so far; its number wraps.
+  std::uint32_t _dropped = 0;
   Thread _thread;
 };
 

@@ -11,6 +11,7 @@
 #include "base/text.h"
 #include "gateway/body_takers.h"
 #include "gateway/envelope.h"
+#include "gateway/piece_writer.h"
 
 namespace veltrad::gateway {
 
@@ -19,6 +20,11 @@ namespace {
 constexpr std::string_view kEventsPath = "/events";
 constexpr std::size_t kMostLabelBytes = 32;
 constexpr std::size_t kPostIDLength = 32;
+// The connection's buffers, and what zlib needs.
+constexpr std::uint64_t kOpenBodyBytes = 24u << 10;
+constexpr std::uint64_t kUnpackingBytes = 40u << 10;
+// Pieces under way, and the next one.
+constexpr std::uint64_t kMostFileBytes = (kMostPiecesUnderWay + 1) * kPieceBytes;
 
 bool isLabel(std::string_view text) {
   return !text.empty() && text.size() <= kMostLabelBytes &&
@@ -94,13 +100,15 @@ std::optional<Refusal> faultOfFields(const RequestHead& head, Place place, bool 
   return std::nullopt;
 }
 
-}  // namespace
-
-bool ByteBudget::take(std::uint64_t bytes) {
-  if (_taken.fetch_add(bytes, std::memory_order_relaxed) + bytes <= _most) return true;
-  give(bytes);
-  return false;
+// What a body is charged before its first byte. A file is charged once for all that it will keep.
+std::uint64_t firstChargeFor(const Wanted& wanted) {
+  const std::uint64_t open = kOpenBodyBytes + (wanted.packed ? kUnpackingBytes : 0);
+  return wanted.place == Place::upload
+             ? open + std::min(wanted.length.value_or(kMostFileBytes), kMostFileBytes)
+             : open;
 }
+
+}  // namespace
 
 Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds) {
   const std::string_view target = head.target();
@@ -114,6 +122,7 @@ Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& boun
   if (head.method() != "POST") return Failure{Refusal{405, "method", "expected POST"}};
   wanted.place = *place;
   wanted.path = path;
+  wanted.length = head.length();
   wanted.packed = mediaTypeOf(head.field("Content-Encoding")) == "gzip";
   if (auto fault = faultOfFields(head, *place, wanted.packed, bounds)) return Failure{std::move(*fault)};
   if (isPostID(head.field("X-VLT-Post-ID"))) wanted.postID = head.field("X-VLT-Post-ID");
@@ -133,13 +142,16 @@ Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& boun
 std::variant<Answer, std::unique_ptr<BodyTaker>> Door::request(const RequestHead& head) {
   auto wanted = wantedBy(head, _services.bounds);
   if (!wanted) return _refusals.answer(wanted.error());
-  switch (wanted.value().place) {
+  const Place place = wanted.value().place;
+  Charge charge(place == Place::events ? _events : _others);
+  if (!charge.to(firstChargeFor(wanted.value()))) return _refusals.busy("no_room");
+  switch (place) {
     case Place::events:
-      return takeEvents(_services, std::move(wanted).value());
+      return takeEvents(_services, std::move(wanted).value(), std::move(charge));
     case Place::upload:
-      return takeFile(_services, std::move(wanted).value());
+      return takeFile(_services, std::move(wanted).value(), std::move(charge));
     case Place::logData:
-      return takeLogData(_services, std::move(wanted).value());
+      return takeLogData(_services, std::move(wanted).value(), std::move(charge));
   }
   return Answer{404, "", "", {}};
 }

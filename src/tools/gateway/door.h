@@ -2,13 +2,14 @@
 // The door for devices' requests: which path takes what, and who takes the body.
 #pragma once
 
-#include <atomic>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <variant>
 
 #include "base/result.h"
+#include "gateway/byte_budget.h"
 #include "gateway/http_server.h"
 #include "gateway/publisher.h"
 #include "gateway/refusals.h"
@@ -22,20 +23,10 @@ struct BodyBounds {
   std::uint64_t logData = 32u << 20;
   std::uint64_t packedFile = std::uint64_t{2} << 30;
   std::uint64_t unpackedFile = std::uint64_t{4} << 30;
-  // All that is being received.
-  std::uint64_t together = 256u << 20;
-};
-
-// Bytes that are being received. Any thread.
-class ByteBudget {
- public:
-  explicit ByteBudget(std::uint64_t most) : _most(most) {}
-  bool take(std::uint64_t bytes);
-  void give(std::uint64_t bytes) { _taken.fetch_sub(bytes, std::memory_order_relaxed); }
-
- private:
-  const std::uint64_t _most;
-  std::atomic<std::uint64_t> _taken{0};
+  // What is kept of all until they are answered: of events, and of files and log data, which leaves half of
+  // what may be held to events.
+  std::uint64_t eventsTogether = 256u << 20;
+  std::uint64_t othersTogether = 128u << 20;
 };
 
 // What those who take bodies use. All of it must outlive them.
@@ -43,7 +34,6 @@ struct DoorServices {
   Publisher& publisher;
   Metrics& metrics;
   Refusals& refusals;
-  ByteBudget& budget;
   BodyBounds bounds;
 };
 
@@ -59,6 +49,8 @@ struct Wanted {
   // Decoded parameters.
   std::map<std::string, std::string> query;
   bool packed = false;
+  // Of the body, where the head says it.
+  std::optional<std::uint64_t> length;
 };
 Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds);
 
@@ -67,14 +59,16 @@ class Door {
  public:
   Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed)
       : _refusals(publisher, metrics, shed),
-        _budget(bounds.together),
-        _services{publisher, metrics, _refusals, _budget, bounds} {}
+        _events(bounds.eventsTogether),
+        _others(bounds.othersTogether),
+        _services{publisher, metrics, _refusals, bounds} {}
 
   std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
 
  private:
   Refusals _refusals;
-  ByteBudget _budget;
+  ByteBudget _events;
+  ByteBudget _others;
   const DoorServices _services;
 };
 

@@ -36,6 +36,20 @@ class PurgePlan {
   std::deque<std::pair<Time, std::uint64_t>> _reached;
 };
 
+// Whether a stream has lost its newest messages, as one does whose servers have all lost power at once. Right
+// after a server has become the leader it may say less than it has, so only what stays so counts.
+class LostTail {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+  static constexpr std::chrono::seconds kLongestCatchUp{20};
+
+  // `last` is the stream's word at this time, `reached` what the tables hold.
+  bool isCertain(std::uint64_t reached, std::uint64_t last, Time now);
+
+ private:
+  std::optional<Time> _since;
+};
+
 struct DrainCounts {
   std::atomic<std::uint64_t> events{0};
   std::atomic<std::uint64_t> messages{0};
@@ -43,8 +57,8 @@ struct DrainCounts {
   std::atomic<std::uint64_t> refused{0};
   std::atomic<std::uint64_t> restarts{0};
   std::atomic<std::uint64_t> behind{0};
-  // Of the last message that was written; nanoseconds since 1970.
-  std::atomic<std::int64_t> lastTime{0};
+  // No message that waits to be written is older; nanoseconds since 1970.
+  std::atomic<std::int64_t> waitingSince{0};
   std::atomic<bool> active{false};
 
   std::string text() const;
@@ -66,8 +80,14 @@ class Drain {
   // From its connections to the first error, or the stop; the error is one line.
   std::string runOnce();
   std::string carry(StreamReader& reader, TableWriter& writer);
+  // The place behind which to read.
+  Result<std::uint64_t, std::string> findPlace(StreamReader& reader, TableWriter& writer, StreamState& state);
+  static Result<std::uint64_t, std::string> placeUpTo(StreamReader& reader, const StreamState& state,
+                                                      std::uint64_t seq, std::int64_t time);
   std::string lookAgain(StreamReader& reader, std::int64_t created);
-  void keepHouse(StreamReader& reader, TableWriter& writer);
+  void measure(StreamReader& reader);
+  // `read`: the time of the last message that was written; 0: none yet.
+  void keepHouse(StreamReader& reader, TableWriter& writer, std::int64_t read);
   bool stopping();
   bool pause(std::chrono::milliseconds time);
 

@@ -16,7 +16,8 @@ bool HeldMessages::add(Message message, Completion completion, Time now) {
   const std::uint64_t token = ++_lastToken;
   _bytes += bytes;
   _tokens.emplace(message.id, token);
-  Held held{std::make_shared<const Message>(std::move(message)), {}, now, now, _bounds.again};
+  Held held{
+      std::make_shared<const Message>(std::move(message)), {}, now, now, _bounds.again, _bounds.afterRefusal};
   held.completions.push_back(std::move(completion));
   _held.emplace_hint(_held.end(), token, std::move(held));
   _due.emplace(now, token);
@@ -57,7 +58,9 @@ std::vector<HeldMessages::Completion> HeldMessages::taken(std::uint64_t token) {
 
 void HeldMessages::refused(std::uint64_t token, Time now) {
   const auto entry = _held.find(token);
-  if (entry != _held.end()) setDue(entry, now + _bounds.afterRefusal);
+  if (entry == _held.end()) return;
+  setDue(entry, now + entry->second.refusalWait);
+  entry->second.refusalWait = std::min(2 * entry->second.refusalWait, 4 * _bounds.again);
 }
 
 void HeldMessages::allDue(Time now) {

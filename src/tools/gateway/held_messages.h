@@ -40,7 +40,8 @@ class HeldMessages {
     Duration hold = std::chrono::seconds(15);
     // When a message without an answer is published again; each further time after twice as long.
     Duration again = std::chrono::seconds(1);
-    // When one that the stream has refused is published again.
+    // When one that the stream has refused is published again; each further time after twice as long, up to
+    // `again` doubled twice.
     Duration afterRefusal = std::chrono::milliseconds(250);
   };
 
@@ -79,6 +80,7 @@ class HeldMessages {
     Time since;
     Time due;
     Duration wait;
+    Duration refusalWait;
   };
   using Entries = std::map<std::uint64_t, Held>;
 

@@ -11,14 +11,15 @@ namespace http = boost::beast::http;
 
 namespace {
 
-constexpr std::size_t kRoomBytes = 16u << 10;
+// A body is read in such pieces.
+constexpr std::size_t kReadBytes = 16u << 10;
 // After a refusal the rest of a body is read and dropped, because closing at once could cost the answer.
 constexpr std::size_t kMostLingering = 32u << 20;
 constexpr std::chrono::seconds kLongestLinger{5};
 
 class Head final : public RequestHead {
  public:
-  Head(const http::request<http::buffer_body>& request, std::optional<std::uint64_t> length)
+  Head(const http::request_header<>& request, std::optional<std::uint64_t> length)
       : _request(request), _length(length) {}
   std::string_view method() const override { return viewOf(_request.method_string()); }
   std::string_view target() const override { return viewOf(_request.target()); }
@@ -30,7 +31,7 @@ class Head final : public RequestHead {
  private:
   static std::string_view viewOf(beast::string_view text) { return {text.data(), text.size()}; }
 
-  const http::request<http::buffer_body>& _request;
+  const http::request_header<>& _request;
   const std::optional<std::uint64_t> _length;
 };
 
@@ -62,7 +63,9 @@ void HTTPConnection::headRead(const Error& error) {
   if (auto* refusal = std::get_if<Answer>(&handled)) return answer(std::move(*refusal), !_parser->is_done());
   _taker = std::move(std::get<std::unique_ptr<BodyTaker>>(handled));
   if (_parser->is_done()) return finish();
-  _room.resize(kRoomBytes);
+  _parser->get().body().taker = _taker.get();
+  _pace = BodyPace(_owner.bounds.stalled);
+  _buffer.reserve(kReadBytes);
   continueThenRead();
 }
 
@@ -92,33 +95,25 @@ void HTTPConnection::readBody() {
     boost::asio::post(self->_stream.get_executor(), [self] { self->readBody(); });
   };
   if (!_taker->hasRoom(resume)) return _stream.expires_never();
-  auto& body = _parser->get().body();
-  body.data = _room.data();
-  body.size = _room.size();
-  body.more = true;
-  _stream.expires_after(_owner.bounds.stalled);
-  http::async_read_some(
-      _stream, _buffer, *_parser,
-      [self = shared_from_this()](const Error& error, std::size_t count) { self->bodyRead(error, count); });
+  const auto begun = std::chrono::steady_clock::now();
+  _stream.expires_after(_pace.left());
+  http::async_read_some(_stream, _buffer, *_parser,
+                        [self = shared_from_this(), begun](const Error& error, std::size_t count) {
+                          self->_pace.passed(std::chrono::steady_clock::now() - begun, count);
+                          self->bodyRead(error);
+                        });
 }
 
-void HTTPConnection::bodyRead(const Error& error, std::size_t) {
-  if (error && error != http::error::need_buffer) {
-    if (error.category() == http::make_error_code(http::error::bad_method).category() &&
-        error != http::error::partial_message && error != http::error::end_of_stream)
-      answer(Answer{400, "", "", {{"X-VLT-Refused", "the body's chunks are malformed"}}}, true);
-    return;
-  }
-  const std::size_t filled = _room.size() - _parser->get().body().size;
-  if (filled > 0) {
-    if (auto refusal = _taker->take({_room.data(), filled}))
-      return answer(std::move(*refusal), !_parser->is_done());
-  }
-  readBody();
+void HTTPConnection::bodyRead(const Error& error) {
+  if (auto& refusal = _parser->get().body().refusal) return answer(std::move(*refusal), !_parser->is_done());
+  if (!error || error == http::error::need_buffer) return readBody();
+  if (error.category() == http::make_error_code(http::error::bad_method).category() &&
+      error != http::error::partial_message && error != http::error::end_of_stream)
+    answer(Answer{400, "", "", {{"X-VLT-Refused", "the body's chunks are malformed"}}}, true);
 }
 
 void HTTPConnection::finish() {
-  _room = {};
+  _buffer.shrink_to_fit();
   _stream.expires_never();
   _taker->finish([self = shared_from_this()](Answer made) {
     boost::asio::post(self->_stream.get_executor(),
@@ -127,7 +122,6 @@ void HTTPConnection::finish() {
 }
 
 void HTTPConnection::answer(Answer made, bool closes) {
-  _room = {};
   closes = closes || _owner.stopping || !_parser->get().keep_alive();
   _response.emplace();
   _response->version(11);
@@ -150,20 +144,20 @@ void HTTPConnection::answered(const Error& error, bool closes) {
   _taker.reset();
   if (error) return;
   if (!closes) {
-    if (_buffer.size() == 0) _buffer = {};
+    _buffer.shrink_to_fit();
     return readHead();
   }
   Error ignored;
   _stream.socket().shutdown(Socket::shutdown_send, ignored);
   if (whole) return;
   _parser.reset();
-  _room.resize(kRoomBytes);
+  _buffer.clear();
   _stream.expires_after(kLongestLinger);
   linger();
 }
 
 void HTTPConnection::linger() {
-  _stream.async_read_some(boost::asio::buffer(_room),
+  _stream.async_read_some(_buffer.prepare(kReadBytes),
                           [self = shared_from_this()](const Error& error, std::size_t count) {
                             self->_lingered += count;
                             if (!error && self->_lingered < kMostLingering) self->linger();

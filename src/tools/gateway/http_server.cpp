@@ -2,11 +2,13 @@
 // Accepts connections, with Boost.Beast, which only this file and http_connection.cpp include.
 #include "gateway/http_server.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <charconv>
 #include <cstring>
+#include <future>
 #include <set>
 
 #include "gateway/http_connection.h"
@@ -127,7 +129,9 @@ Result<std::string, std::string> HTTPServer::listen(const std::string& address) 
     _library->path = address.substr(5);
     if (_library->path.empty() || _library->path.size() >= sizeof(sockaddr_un::sun_path))
       return Failure{address + ": a socket's path has 1 to 107 bytes"};
-    ::unlink(_library->path.c_str());
+    struct stat left {};
+    if (::lstat(_library->path.c_str(), &left) == 0 && S_ISSOCK(left.st_mode))
+      ::unlink(_library->path.c_str());
     endpoint = asio::local::stream_protocol::endpoint(_library->path);
   } else {
     const auto parts = hostAndPortOf(address);
@@ -144,7 +148,12 @@ Result<std::string, std::string> HTTPServer::listen(const std::string& address) 
   if (!error) acceptor.set_option(asio::socket_base::reuse_address(true), error);
   if (!error) acceptor.bind(endpoint, error);
   if (!error) acceptor.listen(asio::socket_base::max_listen_connections, error);
-  if (error) return Failure{address + ": " + error.message()};
+  if (error) {
+    _library->path.clear();
+    return Failure{address + ": " + error.message()};
+  }
+  // nginx has another user; who may connect is decided by the folder.
+  if (!_library->path.empty()) ::chmod(_library->path.c_str(), 0666);
   _library->accept();
   if (!_library->path.empty()) return address;
   const auto bound = acceptor.local_endpoint();
@@ -170,6 +179,12 @@ void HTTPServer::run() {
 
 void HTTPServer::end() {
   _library->context.stop();
+}
+
+bool HTTPServer::answersWithin(std::chrono::seconds time) {
+  const auto passed = std::make_shared<std::promise<void>>();
+  boost::asio::post(_library->context, [passed] { passed->set_value(); });
+  return passed->get_future().wait_for(time) == std::future_status::ready;
 }
 
 std::size_t HTTPServer::connections() const {

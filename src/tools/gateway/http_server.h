@@ -42,8 +42,10 @@ struct Answer {
 class BodyTaker {
  public:
   virtual ~BodyTaker() = default;
-  // The next bytes. An answer refuses the rest: the connection is closed after it.
-  virtual std::optional<Answer> take(std::string_view bytes) = 0;
+  // Takes the next bytes from the front, not all of them if that were a long turn: the rest comes again after
+  // others had theirs. An answer refuses everything: the connection is closed after it, unless it was the
+  // end.
+  virtual std::optional<Answer> take(std::string_view& bytes) = 0;
   // False: there is no room for more bytes now. `resume` is then called once, on any thread, when there is.
   virtual bool hasRoom(std::function<void()> resume) = 0;
   // After the last byte. `answer` is called once, on any thread, now or later.
@@ -60,7 +62,8 @@ class HTTPServer {
     std::size_t headerBytes = 16u << 10;
     // How long a connection may be without a request.
     std::chrono::seconds idle{75};
-    // How long a body may be without a byte, and an answer without one that is taken.
+    // How long a body may be without a byte, or slower than BodyPace allows, and an answer without a byte
+    // that is taken.
     std::chrono::seconds stalled{30};
   };
 
@@ -77,6 +80,8 @@ class HTTPServer {
   // Any thread.
   void end();
   std::size_t connections() const;
+  // Whether the thread that serves does something else within this time.
+  bool answersWithin(std::chrono::seconds time);
 
  private:
   struct Library;

@@ -49,7 +49,12 @@ struct Message {
   std::vector<std::pair<std::string, std::string>> headers;
   std::string body;
 
-  std::size_t bytes() const { return body.size() + id.size() + 256; }
+  // What it keeps in memory, about.
+  std::size_t bytes() const {
+    std::size_t bytes = body.size() + id.size() + 256;
+    for (const auto& [name, text] : headers) bytes += name.size() + text.size();
+    return bytes;
+  }
 };
 
 }  // namespace veltrad::gateway

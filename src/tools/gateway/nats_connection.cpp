@@ -44,7 +44,9 @@ natsStatus applyOptions(natsOptions* made, const StreamOptions& given) {
   then(natsOptions_SetMaxPingsOut(made, kMostPingsOut));
   if (!given.credentials.empty())
     then(natsOptions_SetUserCredentialsFromFiles(made, given.credentials.c_str(), nullptr));
-  if (!given.ca.empty()) then(natsOptions_LoadCATrustedCertificates(made, given.ca.c_str()));
+  if (given.ca.empty()) return status;
+  then(natsOptions_LoadCATrustedCertificates(made, given.ca.c_str()));
+  then(natsOptions_SetSecure(made, true));
   return status;
 }
 
@@ -61,8 +63,10 @@ struct NATSCallbacks {
     static_cast<NATSConnection*>(closure)->_closed.set_value();
   }
   // Without it the library writes to standard error.
-  static void failed(natsConnection*, natsSubscription*, natsStatus status, void*) {
-    logDebug("stream: %s", natsStatus_GetText(status));
+  static void failed(natsConnection*, natsSubscription*, natsStatus status, void* closure) {
+    auto* self = static_cast<NATSConnection*>(closure);
+    if (const auto line = self->_faults.happened(std::string("stream: ") + natsStatus_GetText(status)))
+      logWarning("%s", line->c_str());
   }
 };
 
@@ -77,7 +81,7 @@ Result<std::unique_ptr<NATSConnection>, std::string> NATSConnection::open(const 
   if (status == NATS_OK) status = natsOptions_SetReconnectedCB(made, &NATSCallbacks::connected, self.get());
   if (status == NATS_OK) status = natsOptions_SetDisconnectedCB(made, &NATSCallbacks::disconnected, nullptr);
   if (status == NATS_OK) status = natsOptions_SetClosedCB(made, &NATSCallbacks::closed, self.get());
-  if (status == NATS_OK) status = natsOptions_SetErrorHandler(made, &NATSCallbacks::failed, nullptr);
+  if (status == NATS_OK) status = natsOptions_SetErrorHandler(made, &NATSCallbacks::failed, self.get());
   if (status == NATS_OK)
     status = natsOptions_SetRetryOnFailedConnect(made, true, &NATSCallbacks::connected, self.get());
   if (status == NATS_OK) {

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "base/result.h"
+#include "platform/limited_line.h"
 
 struct __natsConnection;
 struct __jsCtx;
@@ -49,6 +50,7 @@ class NATSConnection {
   __natsConnection* _connection = nullptr;
   __jsCtx* _jetStream = nullptr;
   std::function<void()> _reconnected;
+  platform::LimitedLine _faults{"errors"};
   // No callback follows.
   std::promise<void> _closed;
 };

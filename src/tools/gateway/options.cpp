@@ -28,14 +28,33 @@ Examples:
   veltra-gateway drain --database 'dbname=veltra' --files /srv/veltra/files
   curl http://127.0.0.1:8081/metrics)";
 
+constexpr const char* kNameCharacters = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_-";
+
+std::string faultOfStreamName(const std::string& name) {
+  return !name.empty() && name.find_first_not_of(kNameCharacters) == std::string::npos
+             ? ""
+             : "expected letters, digits, \"_\" and \"-\"";
+}
+
+std::string faultOfPrefix(const std::string& prefix) {
+  const bool good = prefix.size() > 1 && prefix.ends_with('.') && !prefix.starts_with('.') &&
+                    prefix.find("..") == std::string::npos &&
+                    prefix.find_first_not_of(std::string(kNameCharacters) + ".") == std::string::npos;
+  return good ? "" : "expected words with a dot behind each";
+}
+
 void describeStream(CLI::App& app, StreamArguments& given) {
   app.add_option("--server", given.servers, "A server of the stream; repeat the option for each")
       ->type_name("URL")
       ->allow_extra_args(false)
       ->capture_default_str();
-  app.add_option("--stream", given.name, "Name of the stream")->type_name("NAME")->capture_default_str();
+  app.add_option("--stream", given.name, "Name of the stream")
+      ->type_name("NAME")
+      ->check(&faultOfStreamName)
+      ->capture_default_str();
   app.add_option("--prefix", given.prefix, "What stands before each subject, with a dot at its end")
       ->type_name("TEXT")
+      ->check(&faultOfPrefix)
       ->capture_default_str();
   app.add_option("--credentials", given.credentials, "File with the credentials of the stream's user")
       ->type_name("FILE");
@@ -65,9 +84,11 @@ void describeServing(CLI::App& app, ServeArguments& given) {
       ->type_name("SECONDS")
       ->check(CLI::Range(0.1, 60.0))
       ->capture_default_str();
-  app.add_option("--hold-bytes", given.holdBytes, "What is held together, and what is received together")
+  app.add_option(
+         "--hold-bytes", given.holdBytes,
+         "What is held together; as much for events from their head to the answer, half of it for the rest")
       ->type_name("BYTES")
-      ->check(CLI::Range(std::size_t{8} << 20, std::size_t{1} << 40))
+      ->check(CLI::Range(std::size_t{64} << 20, std::size_t{1} << 40))
       ->capture_default_str();
   app.add_option("--hold-messages", given.holdMessages, "How many messages are held")
       ->type_name("N")

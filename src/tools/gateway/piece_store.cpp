@@ -9,12 +9,12 @@
 
 #include <cerrno>
 #include <charconv>
-#include <chrono>
 #include <cstring>
 #include <filesystem>
 #include <optional>
 
 #include "base/file_descriptor.h"
+#include "gateway/table_rows.h"
 
 namespace veltrad::gateway {
 
@@ -24,7 +24,10 @@ namespace fs = std::filesystem;
 
 constexpr std::uint64_t kMostBody = std::uint64_t{1} << 40;
 constexpr std::uint64_t kMostInMemory = 512u << 20;
-constexpr std::chrono::hours kForgottenAfter{24};
+// Seconds.
+constexpr std::int64_t kForgottenAfter = 86'400;
+constexpr std::int64_t kNanoseconds = 1'000'000'000;
+constexpr std::size_t kDayLength = 10;
 
 struct PiecePlace {
   std::string token;
@@ -55,21 +58,39 @@ Result<Done, StoreError> PieceStore::open() {
   const fs::path below = fs::path(_folder) / "incoming";
   fs::create_directories(below, error);
   if (error) return passingFailure(below.string() + ": " + error.message());
-  for (const auto& entry : fs::directory_iterator(below, error)) {
-    const auto changed = entry.last_write_time(error);
-    if (!error && changed < fs::file_time_type::clock::now() - kForgottenAfter)
-      fs::remove(entry.path(), error);
-  }
   return Done();
 }
 
-Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_view bytes) {
+void PieceStore::forgetUnfinished(std::int64_t read) {
+  std::error_code error;
+  for (const auto& entry : fs::directory_iterator(fs::path(_folder) / "incoming", error)) {
+    struct stat found {};
+    if (::stat(entry.path().c_str(), &found) == 0 &&
+        found.st_mtim.tv_sec < read / kNanoseconds - kForgottenAfter)
+      ::unlink(entry.path().c_str());
+  }
+}
+
+void PieceStore::forgetDaysBefore(std::string_view day) {
+  std::error_code error;
+  for (const auto& entry : fs::directory_iterator(_folder, error)) {
+    const std::string name = entry.path().filename().string();
+    if (name.size() != kDayLength || name.find_first_not_of("0123456789-") != std::string::npos ||
+        name >= day)
+      continue;
+    std::error_code passing;
+    fs::remove_all(entry.path(), passing);
+  }
+}
+
+Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_view bytes,
+                                           std::int64_t time) {
   const auto where = placeIn(place);
   if (!where) return dataFailure(fmt::format("a piece without a place: \"{}\"", place));
   const std::string path = incoming(where->token);
   const FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_NOFOLLOW | O_CLOEXEC, 0640));
   if (!file.isOpen()) return failureOfFile(path);
-  _unsynced.insert(path);
+  _unsynced.insert({path, _folder + "/incoming"});
   std::uint64_t at = where->offset;
   while (!bytes.empty()) {
     const ssize_t count = ::pwrite(file.get(), bytes.data(), bytes.size(), static_cast<off_t>(at));
@@ -78,6 +99,8 @@ Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_v
     at += static_cast<std::uint64_t>(count);
     bytes.remove_prefix(static_cast<std::size_t>(count));
   }
+  const timespec times[] = {{0, UTIME_OMIT}, {time / kNanoseconds, time % kNanoseconds}};
+  if (::futimens(file.get(), times) != 0) return failureOfFile(path);
   return Done();
 }
 
@@ -88,6 +111,7 @@ Result<std::string, StoreError> PieceStore::wholeOf(std::string_view place, std:
     return dataFailure(fmt::format("a body without a place: \"{}\"", place));
   const std::string path = incoming(where->token);
   const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+  if (!file.isOpen() && errno == ENOENT) return dataFailure(path + ": its pieces are missing");
   if (!file.isOpen()) return failureOfFile(path);
   std::string body(where->offset, '\0');
   for (std::size_t at = 0; at < body.size();) {
@@ -100,26 +124,37 @@ Result<std::string, StoreError> PieceStore::wholeOf(std::string_view place, std:
   return body.append(last);
 }
 
+Result<bool, StoreError> PieceStore::exists(const std::string& path) {
+  struct stat found {};
+  if (::stat(path.c_str(), &found) == 0) return true;
+  if (errno == ENOENT) return false;
+  return failureOfFile(path);
+}
+
 Result<std::string, StoreError> PieceStore::keep(std::string_view place, std::string_view last,
-                                                 const std::string& day, const std::string& name) {
+                                                 const std::string& name, std::int64_t time) {
+  const std::string day = dayText(time);
   const std::string kept = day + "/" + name;
   const std::string path = _folder + "/" + kept;
   std::error_code error;
   fs::create_directories(_folder + "/" + day, error);
   if (error) return passingFailure(path + ": " + error.message());
+  _unsynced.insert({_folder, _folder + "/" + day});
   // A batch that is repeated finds the file that it has made.
-  if (fs::exists(path, error)) return kept;
+  const auto made = exists(path);
+  if (!made) return Failure{made.error()};
+  if (made.value()) return kept;
   const std::string whole = place.empty() ? name + " 0" : std::string(place);
   const auto where = placeIn(whole);
   if (!where) return dataFailure(fmt::format("a file without a place: \"{}\"", whole));
-  if (!place.empty() && !fs::exists(incoming(where->token), error))
-    return dataFailure(path + ": its pieces are missing");
-  if (auto written = write(whole, last); !written) return Failure{written.error()};
   const std::string from = incoming(where->token);
+  const auto begun = exists(from);
+  if (!begun) return Failure{begun.error()};
+  if (!place.empty() && !begun.value()) return dataFailure(path + ": its pieces are missing");
+  if (auto written = write(whole, last, time); !written) return Failure{written.error()};
   const FileDescriptor file(::open(from.c_str(), O_WRONLY | O_CLOEXEC));
   if (::fsync(file.get()) != 0 || ::rename(from.c_str(), path.c_str()) != 0) return failureOfFile(from);
   _unsynced.erase(from);
-  _unsynced.insert(_folder + "/" + day);
   return kept;
 }
 

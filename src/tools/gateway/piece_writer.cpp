@@ -9,8 +9,6 @@ namespace veltrad::gateway {
 
 namespace {
 
-constexpr std::size_t kMostPiecesUnderWay = 4;
-
 std::string randomToken() {
   const auto bytes = platform::randomUUID();
   return hex({reinterpret_cast<const char*>(bytes.data()), bytes.size()});
@@ -33,9 +31,13 @@ void PieceWriter::add(std::string_view bytes) {
 }
 
 void PieceWriter::publishPiece() {
+  _waiting.shrink_to_fit();
+  std::string full = std::exchange(_waiting, {});
+  // Where there is one piece there is another, so the room is not found by doubling it.
+  _waiting.reserve(kPieceBytes);
+  if (outcome() != Outcome::taken) return;
   if (_token.empty()) _token = randomToken();
-  Message piece{subject::kPieces, "piece " + place(), {{header::kPiece, place()}}, std::move(_waiting)};
-  _waiting.clear();
+  Message piece{subject::kPieces, "piece " + place(), {{header::kPiece, place()}}, std::move(full)};
   _offset += piece.body.size();
   {
     const Lock hold(_shared->mutex);
@@ -65,8 +67,14 @@ bool PieceWriter::hasRoom(std::function<void()> resume) {
   return false;
 }
 
+Outcome PieceWriter::outcome() const {
+  const Lock hold(_shared->mutex);
+  return _shared->outcome;
+}
+
 void PieceWriter::commit(Message last, Publisher::Completion done) {
   if (!_token.empty()) last.headers.emplace_back(header::kPiece, place());
+  _waiting.shrink_to_fit();
   last.body = std::move(_waiting);
   auto publishLast = [shared = _shared, last = std::move(last), done = std::move(done)]() mutable {
     Outcome pieces;

@@ -1,8 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-// Charges the budget as the body grows.
+// Charges what the body keeps as it grows.
 #include "gateway/received_body.h"
 
 #include <fmt/format.h>
+
+#include <algorithm>
+#include <utility>
 
 namespace veltrad::gateway {
 
@@ -13,7 +16,8 @@ Refusal refusalOf(Gunzip::State state, std::uint64_t most) {
     case Gunzip::State::tail:
       return {400, "gzip", "bytes follow the gzip stream"};
     case Gunzip::State::tooLarge:
-      return {413, "too_large", fmt::format("the body unpacks to more than {} bytes", most)};
+      return {413, "too_large",
+              fmt::format("the body unpacks to more than {} bytes, or to far more than what came", most)};
     case Gunzip::State::open:
       return {400, "gzip", "the gzip stream is cut short"};
     default:
@@ -21,18 +25,22 @@ Refusal refusalOf(Gunzip::State state, std::uint64_t most) {
   }
 }
 
-ReceivedBody::ReceivedBody(const DoorServices& services, bool packed, std::uint64_t most)
-    : _services(services), _most(most) {
+ReceivedBody::ReceivedBody(const DoorServices& services, Charge charge, bool packed, std::uint64_t most)
+    : _services(services), _most(most), _charge(std::move(charge)), _chargedWithoutText(_charge.bytes()) {
   if (packed) _gunzip.emplace(most);
 }
 
-ReceivedBody::~ReceivedBody() {
-  _services.budget.give(_charged);
-}
-
-bool ReceivedBody::grow(std::size_t bytes) {
-  if (!_services.budget.take(bytes)) return false;
-  _charged += bytes;
+// A string would double its room, whatever the bound is.
+bool ReceivedBody::keep(std::string_view bytes) {
+  const std::size_t size = _text.size() + bytes.size();
+  if (size > _text.capacity()) {
+    const std::size_t room = std::max<std::size_t>(size, std::min<std::size_t>(2 * _text.capacity(), _most));
+    if (!_charge.to(_chargedWithoutText + room)) return false;
+    std::string larger;
+    larger.reserve(room);
+    _text = std::move(larger.append(_text));
+  }
+  _text.append(bytes);
   return true;
 }
 
@@ -43,32 +51,42 @@ Answer ReceivedBody::refusedGzip(Gunzip::State state) {
                                : _services.refusals.answer(refusal);
 }
 
-std::optional<Answer> ReceivedBody::add(std::string_view bytes) {
-  _received += bytes.size();
+std::optional<Answer> ReceivedBody::add(std::string_view& bytes) {
+  const std::string_view given = bytes;
+  bool room = true;
+  auto state = Gunzip::State::open;
+  if (_gunzip) {
+    state = _gunzip->add(bytes, [&](std::string_view unpacked) { room = room && keep(unpacked); });
+  } else {
+    room = keep(bytes);
+    bytes = {};
+  }
+  _received += given.size() - bytes.size();
   if (_received > _most)
     return _services.refusals.answer(
         {413, "too_large", fmt::format("a body here has at most {} bytes", _most)});
-  bool room = true;
-  if (!_gunzip) {
-    room = grow(bytes.size());
-    if (room) _text.append(bytes);
-  } else {
-    const auto state = _gunzip->add(bytes, [&](std::string_view unpacked) {
-      room = room && grow(unpacked.size());
-      if (room) _text.append(unpacked);
-    });
-    if (room && state != Gunzip::State::open && state != Gunzip::State::ended) {
-      if (_text.empty()) _text = bytes.substr(0, Refusals::kMostKeptBytes);
-      return refusedGzip(state);
-    }
-  }
   if (!room) return _services.refusals.busy("no_room");
-  return std::nullopt;
+  if (state == Gunzip::State::open || state == Gunzip::State::ended) return std::nullopt;
+  if (_text.empty()) _text = given.substr(0, Refusals::kMostKeptBytes);
+  return refusedGzip(state);
 }
 
 std::optional<Answer> ReceivedBody::end() {
   if (!_gunzip || _gunzip->state() == Gunzip::State::ended) return std::nullopt;
   return refusedGzip(_gunzip->state());
+}
+
+std::string ReceivedBody::take() {
+  _text.shrink_to_fit();
+  return std::exchange(_text, {});
+}
+
+bool ReceivedBody::becomes(const Message& message) {
+  _gunzip.reset();
+  // An assignment of an empty text would leave it its memory.
+  _text.clear();
+  _text.shrink_to_fit();
+  return _charge.to(message.bytes());
 }
 
 }  // namespace veltrad::gateway

@@ -13,29 +13,31 @@ namespace veltrad::gateway {
 
 class ReceivedBody {
  public:
-  // `most`: of the body as it comes and unpacked, in bytes.
-  ReceivedBody(const DoorServices& services, bool packed, std::uint64_t most);
-  ~ReceivedBody();
+  // `charge` is what it is charged without its bytes. `most`: of the body as it comes and unpacked, in bytes.
+  ReceivedBody(const DoorServices& services, Charge charge, bool packed, std::uint64_t most);
 
-  // The next bytes; an answer refuses them.
-  std::optional<Answer> add(std::string_view bytes);
+  // Takes the next bytes from the front; an answer refuses them.
+  std::optional<Answer> add(std::string_view& bytes);
   // After the last byte: a gzip stream that is cut short is refused.
   std::optional<Answer> end();
   const std::string& text() const { return _text; }
   // Leaves it empty.
-  std::string take() { return std::move(_text); }
+  std::string take();
+  // Forgets everything: what is charged from now on, to the end, is the message. False: there is no room for
+  // it.
+  bool becomes(const Message& message);
 
  private:
   Answer refusedGzip(support::Gunzip::State state);
-  bool grow(std::size_t bytes);
+  bool keep(std::string_view bytes);
 
   const DoorServices& _services;
   const std::uint64_t _most;
+  Charge _charge;
+  const std::uint64_t _chargedWithoutText;
   std::optional<support::Gunzip> _gunzip;
   std::string _text;
   std::uint64_t _received = 0;
-  // Of the budget.
-  std::uint64_t _charged = 0;
 };
 
 // The status and reason of a gzip stream that is not as it should be.

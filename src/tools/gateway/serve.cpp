@@ -8,6 +8,7 @@
 #include <csignal>
 #include <cstdio>
 #include <future>
+#include <optional>
 
 #include "formats/json.h"
 #include "gateway/admin.h"
@@ -19,9 +20,12 @@ namespace veltrad::gateway {
 
 namespace {
 
-// What has begun is answered until then; the process ends soon after.
-constexpr std::chrono::seconds kLongestStop{13};
+// What has begun is answered until then.
+constexpr std::chrono::seconds kLongestStop{10};
+// The process ends then, whatever still blocks: what was confirmed is in the stream, or in the tables.
+constexpr unsigned kLongestEndSeconds = 14;
 constexpr std::size_t kServingStackBytes = 1u << 20;
+constexpr std::chrono::seconds kLongestTurn{2};
 
 sigset_t stopSignals() {
   sigset_t signals;
@@ -54,15 +58,27 @@ HeldMessages::Bounds heldBounds(const ServeArguments& given) {
 
 BodyBounds bodyBounds(const ServeArguments& given) {
   BodyBounds bounds;
-  bounds.together = given.holdBytes;
+  bounds.eventsTogether = given.holdBytes;
+  bounds.othersTogether = given.holdBytes / 2;
   return bounds;
 }
+
+Admin::Questions questionsTo(const Publisher& publisher, Metrics& metrics, HTTPServer& server) {
+  return {[&publisher, &server]() -> std::string {
+            if (!publisher.ready()) return "the stream is not there";
+            return server.answersWithin(kLongestTurn) ? "" : "requests are not being served";
+          },
+          [&publisher, &metrics, &server] {
+            metrics.connections = static_cast<std::int64_t>(server.connections());
+            return metrics.text(publisher.held());
+          }};
+}
+
+}  // namespace
 
 std::string asURL(const std::string& address) {
   return address.starts_with("unix:") ? address : "http://" + address;
 }
-
-}  // namespace
 
 void blockStopSignals() {
   const sigset_t signals = stopSignals();
@@ -74,6 +90,8 @@ void awaitStop() {
   const sigset_t signals = stopSignals();
   int signal = 0;
   sigwait(&signals, &signal);
+  std::signal(SIGALRM, [](int) { ::_exit(0); });
+  ::alarm(kLongestEndSeconds);
 }
 
 void sayReady(const Dictionary& line) {
@@ -115,12 +133,8 @@ int serve(const Arguments& given) {
     if (!bound) return failed("--dashboard " + bound.error());
     line.set("dashboard", bound.value());
   }
-  Admin admin({[&publisher] { return publisher->ready() ? "" : "the stream is not there"; },
-               [&publisher, &metrics, &server] {
-                 metrics.connections = static_cast<std::int64_t>(server.connections());
-                 return metrics.text(publisher->held());
-               }});
-  const auto looked = admin.start(given.serve.admin);
+  std::optional<Admin> admin(std::in_place, questionsTo(*publisher, metrics, server));
+  const auto looked = admin->start(given.serve.admin);
   if (!looked) return failed("--admin " + looked.error());
   line.set("admin", asURL(looked.value()));
   Thread serving;
@@ -130,11 +144,13 @@ int serve(const Arguments& given) {
   awaitStop();
   platform::ServiceManager().stopping();
   const auto end = std::chrono::steady_clock::now() + kLongestStop;
-  datagrams.stop();
   publisher->endBy(end);
   std::promise<void> idle;
   server.stop([&idle] { idle.set_value(); });
   idle.get_future().wait_until(end + std::chrono::seconds(1));
+  // Until now, because senders do not learn that this socket of many has no reader.
+  datagrams.stop();
+  admin.reset();
   server.end();
   serving.join();
   publisher.reset();

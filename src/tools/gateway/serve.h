@@ -12,8 +12,11 @@ namespace veltrad::gateway {
 
 // Blocks SIGTERM and SIGINT, so that only awaitStop() gets them. Before any thread is started.
 void blockStopSignals();
-// Returns when one of them has come.
+// Returns when one of them has come. From then on the process has 14 seconds, and ends after them with status
+// 0.
 void awaitStop();
+// The address of a listener as the line names it.
+std::string asURL(const std::string& address);
 // One JSON line on standard output, and the word to the service manager.
 void sayReady(const Dictionary& line);
 

@@ -6,6 +6,7 @@
 
 #include <charconv>
 #include <chrono>
+#include <optional>
 #include <string_view>
 
 #include "formats/json.h"
@@ -22,16 +23,19 @@ constexpr int kMostAnswersWaiting = 1 << 20;
 constexpr std::chrono::seconds kLongestUnsubscribe{5};
 constexpr const char* kStatusHeader = "Status";
 
-// The answer of a stream: {"stream": …, "seq": …} or {"error": {"description": …}}. Empty if it has taken the
-// message.
+// Empty if the stream has taken the message.
 std::string refusalIn(natsMsg* answer) {
   const char* status = nullptr;
   if (natsMsg_GetDataLength(answer) == 0)
     return natsMsgHeader_Get(answer, kStatusHeader, &status) == NATS_OK
                ? std::string("nobody listens, status ") + status
                : "an empty answer";
-  const std::string_view text(natsMsg_GetData(answer),
-                              static_cast<std::size_t>(natsMsg_GetDataLength(answer)));
+  return refusalInAnswer({natsMsg_GetData(answer), static_cast<std::size_t>(natsMsg_GetDataLength(answer))});
+}
+
+}  // namespace
+
+std::string refusalInAnswer(std::string_view text) {
   const auto parsed = formats::parseJSON(text);
   const Dictionary* fields = parsed ? parsed.value().asDictionary() : nullptr;
   if (!fields) return "an answer that is no object";
@@ -39,10 +43,10 @@ std::string refusalIn(natsMsg* answer) {
     const std::string* description = error->string("description");
     return description && !description->empty() ? *description : "an error without a description";
   }
-  return fields->contains("seq") ? "" : "an answer without a place in the stream";
+  const Value* seq = fields->find("seq");
+  // Some servers answer 0 for an ID that is only on its way into the stream, which it may never reach.
+  return seq && seq->toInt64().value_or(0) > 0 ? "" : "an answer without a place in the stream";
 }
-
-}  // namespace
 
 struct StreamCallbacks {
   static void answered(natsConnection*, natsSubscription*, natsMsg* answer, void* closure) {
@@ -111,11 +115,14 @@ void Stream::publish(std::uint64_t token, const Message& message) {
   if (status == NATS_OK) status = natsConnection_PublishMsg(_connection->get(), made);
   natsMsg_Destroy(made);
   // It is published again when no answer comes.
-  if (status != NATS_OK) logDebug("stream: a message was not published: %s", natsStatus_GetText(status));
+  if (status == NATS_OK) return;
+  if (const auto line = _unpublished.happened(std::string("stream: a message was not published: ") +
+                                              natsStatus_GetText(status)))
+    logWarning("%s", line->c_str());
 }
 
-bool Stream::isThere() {
-  if (!_connection->connected()) return false;
+std::string Stream::faultOfStream() {
+  if (!_connection->connected()) return "no server can be reached";
   jsOptions options;
   jsOptions_Init(&options);
   options.Wait = kAnswerMilliseconds;
@@ -141,18 +148,24 @@ bool Stream::isThere() {
       logInfo("stream: %s is made, with %d copies", _options.name.c_str(), _options.copies);
   }
   jsStreamInfo_Destroy(info);
-  if (status != NATS_OK)
-    logDebug("stream: %s is not there: %s, error %d", _options.name.c_str(), natsStatus_GetText(status),
-             static_cast<int>(error));
-  return status == NATS_OK;
+  if (status == NATS_OK) return "";
+  const char* detail = nats_GetLastError(nullptr);
+  return detail && *detail ? detail : natsStatus_GetText(status);
 }
 
 void Stream::watch() {
+  std::optional<std::string> said;
   for (;;) {
-    const bool there = isThere();
-    const bool was = _ready.exchange(there);
-    if (there != was) logInfo("stream: %s is %s", _options.name.c_str(), there ? "ready" : "not ready");
-    if (there && !was) _listener.back();
+    const std::string fault = faultOfStream();
+    const bool was = _ready.exchange(fault.empty());
+    if (fault != said) {
+      if (fault.empty())
+        logInfo("stream: %s is ready", _options.name.c_str());
+      else
+        logWarning("stream: %s is not there: %s", _options.name.c_str(), fault.c_str());
+    }
+    said = fault;
+    if (fault.empty() && !was) _listener.back();
     const Lock hold(_mutex);
     if (!_stopping) _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + std::chrono::seconds(1));
     if (_stopping) return;

@@ -8,16 +8,22 @@
 #include <future>
 #include <memory>
 #include <string>
+#include <string_view>
 
 #include "base/mutex.h"
 #include "base/result.h"
 #include "base/thread.h"
 #include "gateway/message.h"
 #include "gateway/nats_connection.h"
+#include "platform/limited_line.h"
 
 struct __natsSubscription;
 
 namespace veltrad::gateway {
+
+// Why the stream has not taken a message, from its answer: {"stream": …, "seq": …} or {"error":
+// {"description": …}}. Empty: it has.
+std::string refusalInAnswer(std::string_view text);
 
 // Publishes without waiting for answers. A thread of its own makes the stream where it is missing and asks
 // every second whether it is there.
@@ -43,12 +49,14 @@ class Stream {
   friend struct StreamCallbacks;
   Stream(StreamOptions options, Listener listener);
   void watch();
-  bool isThere();
+  // Why the stream is not there, as one line; empty: it is.
+  std::string faultOfStream();
 
   const StreamOptions _options;
   const Listener _listener;
   std::unique_ptr<NATSConnection> _connection;
   __natsSubscription* _answers = nullptr;
+  platform::LimitedLine _unpublished{"messages"};
   // Answers to a message come to this and its token.
   std::string _inbox;
   std::atomic<bool> _ready{false};

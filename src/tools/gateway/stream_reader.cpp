@@ -12,7 +12,9 @@ namespace veltrad::gateway {
 
 namespace {
 
-constexpr std::int64_t kWaitMilliseconds = 1'000;
+constexpr std::int64_t kWaitNanoseconds = 1'000'000'000;
+// A message has at most 8 MiB, see fleet/stream.conf.
+constexpr std::int64_t kMostBytesAtOnce = 32 << 20;
 constexpr std::int64_t kReaderMilliseconds = 3'000;
 constexpr std::int64_t kInactiveNanoseconds = 60'000'000'000;
 
@@ -93,10 +95,15 @@ Result<Done, std::string> StreamReader::startBehind(std::uint64_t seq) {
 
 Result<std::vector<Taken>, std::string> StreamReader::read(int most) {
   natsMsgList list{};
-  jsErrCode error = static_cast<jsErrCode>(0);
-  const natsStatus status = natsSubscription_Fetch(&list, _subscription, most, kWaitMilliseconds, &error);
+  jsFetchRequest wanted;
+  jsFetchRequest_Init(&wanted);
+  wanted.Batch = most;
+  wanted.MaxBytes = kMostBytesAtOnce;
+  wanted.Expires = kWaitNanoseconds;
+  const natsStatus status = natsSubscription_FetchRequest(&list, _subscription, &wanted);
   if (status == NATS_TIMEOUT && _connection->connected()) return std::vector<Taken>();
-  if (status != NATS_OK) return Failure{failureOf("the stream cannot be read", status, error)};
+  if (status != NATS_OK)
+    return Failure{failureOf("the stream cannot be read", status, static_cast<jsErrCode>(0))};
   std::vector<Taken> taken;
   taken.reserve(static_cast<std::size_t>(list.Count));
   std::optional<std::string> fault;
@@ -128,6 +135,19 @@ std::optional<std::string> StreamReader::add(natsMsg* message, std::vector<Taken
   one.body.assign(natsMsg_GetData(message), static_cast<std::size_t>(natsMsg_GetDataLength(message)));
   taken.push_back(std::move(one));
   return std::nullopt;
+}
+
+Result<std::optional<std::int64_t>, std::string> StreamReader::timeAt(std::uint64_t seq) {
+  jsOptions options = answerWithin(kReaderMilliseconds);
+  jsErrCode error = static_cast<jsErrCode>(0);
+  natsMsg* message = nullptr;
+  const natsStatus status =
+      js_GetMsg(&message, _connection->jetStream(), _options.name.c_str(), seq, &options, &error);
+  if (status == NATS_NOT_FOUND) return std::optional<std::int64_t>();
+  if (status != NATS_OK) return Failure{failureOf("a message cannot be looked at", status, error)};
+  const std::int64_t time = natsMsg_GetTime(message);
+  natsMsg_Destroy(message);
+  return std::optional(time);
 }
 
 Result<Done, std::string> StreamReader::purge(std::uint64_t seq) {

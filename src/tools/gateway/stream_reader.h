@@ -43,9 +43,11 @@ class StreamReader {
   Result<StreamState, std::string> state();
   // Reads what comes behind `seq`, through a consumer that is made for it.
   Result<Done, std::string> startBehind(std::uint64_t seq);
-  // The next messages, at most `most`; none if nothing has come within a second. An error, also one for a
-  // gap, asks for a new start.
+  // The next messages, at most `most` and about 32 MiB; none if nothing has come within a second. An error,
+  // also one for a gap, asks for a new start.
   Result<std::vector<Taken>, std::string> read(int most);
+  // The time of the message at this place, in nanoseconds since 1970; absent: there is none.
+  Result<std::optional<std::int64_t>, std::string> timeAt(std::uint64_t seq);
   // The stream may forget everything up to `seq`.
   Result<Done, std::string> purge(std::uint64_t seq);
   // The messages behind the last that was read.

@@ -10,6 +10,7 @@
 #include "base/text.h"
 #include "formats/json.h"
 #include "gateway/clean_json.h"
+#include "tools/dashboard_packet.h"
 
 namespace veltrad::gateway {
 
@@ -43,6 +44,10 @@ std::string timestampText(std::int64_t nanoseconds) {
   return fmt::format("{:04}-{:02}-{:02} {:02}:{:02}:{:02}.{:06}+00", parts.tm_year + 1900, parts.tm_mon + 1,
                      parts.tm_mday, parts.tm_hour, parts.tm_min, parts.tm_sec,
                      nanoseconds % kNanoseconds / 1'000);
+}
+
+std::string dayText(std::int64_t nanoseconds) {
+  return timestampText(nanoseconds).substr(0, 10);
 }
 
 void CopyRow::begin() {
@@ -111,6 +116,16 @@ CopyRow& CopyRow::null() {
   return *this;
 }
 
+std::size_t TableRows::bytes() const {
+  return events.size() + datagrams.size() + files.size() + logData.size() + refused.size() + posts.size();
+}
+
+void TableRows::clear() {
+  // The memory goes, too; an assignment would keep it.
+  for (std::string* rows : {&events, &datagrams, &files, &logData, &refused, &posts})
+    std::string().swap(*rows);
+}
+
 Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string body) {
   const auto envelope = parseEnvelope(std::move(body));
   if (!envelope) return Failure{envelope.error()};
@@ -127,21 +142,21 @@ Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string
     row.text(formats::writeJSON(event));
   }
   eventCount += envelope.value().events.size();
-  if (index > 0) days.insert(timestampText(message.time).substr(0, 10));
+  if (index > 0) days.insert(dayText(message.time));
   return Done();
 }
 
 Result<Done, std::string> TableRows::addDatagram(const Taken& message) {
   const auto parsed = parseCleanJSON(message.body);
   const Dictionary* fields = parsed ? parsed.value().asDictionary() : nullptr;
-  const Value* items = fields ? fields->find("fields") : nullptr;
-  if (!items || !items->asDictionary()) return Failure{std::string("it is no datagram")};
+  const std::string* text = fields ? fields->string("text") : nullptr;
+  if (!text) return Failure{std::string("it is no datagram")};
   CopyRow row(datagrams);
   row.time(message.time).number(static_cast<std::int64_t>(message.seq));
   row.text(textIn(*fields, "deviceID")).text(textIn(*fields, "sender"));
   for (const char* key : {"sessionID", "clientVersion", "category", "type", "eventNumber"})
     row.number(numberIn(*fields, key));
-  row.text(textIn(*fields, "text")).text(formats::writeJSON(*items));
+  row.text(*text).text(formats::writeJSON(tools::itemsOfText(*text)));
   return Done();
 }
 

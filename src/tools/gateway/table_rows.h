@@ -40,6 +40,8 @@ class CopyRow {
 
 // "2026-11-26 03:46:00.123456+00"
 std::string timestampText(std::int64_t nanoseconds);
+// "2026-11-26"
+std::string dayText(std::int64_t nanoseconds);
 
 // The rows that a batch of messages becomes.
 struct TableRows {
@@ -47,6 +49,10 @@ struct TableRows {
   std::uint64_t eventCount = 0;
   // The days of the events, "2026-11-26".
   std::set<std::string> days;
+
+  std::size_t bytes() const;
+  // Forgets the rows; the count and the days stay.
+  void clear();
 
   // Each adds the rows of one message; the error says why it has none. `body` is the message's whole body.
   Result<Done, std::string> addEvents(const Taken& message, std::string body);

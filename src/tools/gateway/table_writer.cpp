@@ -12,8 +12,11 @@ namespace veltrad::gateway {
 
 namespace {
 
-// Of the advisory lock that the active drain holds as long as its connection.
-constexpr const char* kTryLock = "SELECT pg_try_advisory_lock(hashtext('veltra-gateway drain'))";
+// The advisory lock is held as long as the connection.
+constexpr const char* kTryLock =
+    "SELECT pg_try_advisory_lock(hashtext('veltra-gateway drain'), hashtext($1))";
+// Rows are copied when they have grown to this, all in one transaction.
+constexpr std::size_t kMostRowBytes = 16u << 20;
 
 // Only digits of IDs get into statements.
 bool hasPostID(const std::string& text) {
@@ -23,50 +26,59 @@ bool hasPostID(const std::string& text) {
 
 }  // namespace
 
-Result<bool, StoreError> TableWriter::becomeActive(Database& database) {
-  const auto got = database.run(kTryLock);
+Result<bool, StoreError> TableWriter::becomeActive(Database& database, const std::string& stream) {
+  const auto got = database.run(kTryLock, {stream});
   if (!got) return Failure{got.error()};
   return !got.value().empty() && got.value().front() == "t";
 }
 
 Result<Done, StoreError> TableWriter::prepare(Database& database) {
-  const auto made = database.run(kSchema);
+  const std::string mark = "veltra-gateway " + digestOf("", kSchema);
+  const auto known = database.run("SELECT obj_description(to_regnamespace('veltra')::oid, 'pg_namespace')");
+  if (!known) return Failure{known.error()};
+  if (!known.value().empty() && known.value().front() == mark) return Done();
+  const auto made = database.run(std::string(kSchema) + "COMMENT ON SCHEMA veltra IS '" + mark + "'");
   if (!made) return Failure{made.error()};
   return Done();
 }
 
-Result<std::uint64_t, StoreError> TableWriter::position(std::int64_t created) {
+Result<TableWriter::Position, StoreError> TableWriter::position(std::int64_t created) {
   const auto put = _database->run(
-      "INSERT INTO veltra.position (stream, created, seq) VALUES ($1, $2, 0) ON CONFLICT (stream) DO UPDATE "
-      "SET created = excluded.created, seq = CASE WHEN veltra.position.created = excluded.created "
-      "THEN veltra.position.seq ELSE 0 END RETURNING seq",
+      "INSERT INTO veltra.position AS old (stream, created, seq, time) VALUES ($1, $2, 0, 0) "
+      "ON CONFLICT (stream) DO UPDATE SET created = excluded.created, "
+      "seq = CASE WHEN old.created = excluded.created THEN old.seq ELSE 0 END, "
+      "time = CASE WHEN old.created = excluded.created THEN old.time ELSE 0 END RETURNING seq || ' ' || time",
       {_stream, std::to_string(created)});
   if (!put) return Failure{put.error()};
   if (put.value().empty()) return passingFailure("the position was not written");
+  const std::string& found = put.value().front();
   _created = created;
-  _position = std::stoull(put.value().front());
-  return _position;
+  _position = std::stoull(found);
+  return Position{_position, std::stoll(found.substr(found.find(' ') + 1))};
 }
 
 Result<TableWriter::Written, StoreError> TableWriter::write(const std::vector<Taken>& messages) {
   if (messages.empty()) return Written();
-  const Taken* begin = messages.data();
-  const Taken* end = begin + messages.size();
+  return writeHalves(messages.data(), messages.data() + messages.size());
+}
+
+Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const Taken* begin, const Taken* end) {
   auto written = writeTogether(begin, end, "");
   if (written || written.error().kind != StoreError::Kind::data) return written;
-  // One of them cannot be stored as it is: it is found, and kept in another table.
-  Written total;
-  for (const Taken* one = begin; one != end; ++one) {
-    auto alone = writeTogether(one, one + 1, "");
-    if (!alone && alone.error().kind == StoreError::Kind::data) {
-      alone = writeTogether(one, one + 1, "drain: " + alone.error().detail);
-      ++total.refused;
-    }
-    if (!alone) return alone;
-    total.events += alone.value().events;
-    total.skipped += alone.value().skipped;
+  // One of them cannot be stored as it is: it is found in few transactions, and kept in another table.
+  if (end - begin == 1) {
+    written = writeTogether(begin, end, "drain: " + written.error().detail);
+    if (written) written.value().refused = 1;
+    return written;
   }
-  return total;
+  const Taken* middle = begin + (end - begin) / 2;
+  const auto first = writeHalves(begin, middle);
+  if (!first) return first;
+  written = writeHalves(middle, end);
+  if (!written) return written;
+  return Written{first.value().events + written.value().events,
+                 first.value().skipped + written.value().skipped,
+                 first.value().refused + written.value().refused};
 }
 
 Result<TableWriter::Written, StoreError> TableWriter::writeTogether(const Taken* begin, const Taken* end,
@@ -84,7 +96,7 @@ Result<TableWriter::Written, StoreError> TableWriter::writeTogether(const Taken*
   if (auto synced = _files.sync(); !synced) return undo(synced.error());
   if (auto copied = copyRows(batch.value().rows); !copied) return undo(copied.error());
   const std::uint64_t seq = (end - 1)->seq;
-  if (auto advanced = advance(seq); !advanced) return undo(advanced.error());
+  if (auto advanced = advance({seq, (end - 1)->time}); !advanced) return undo(advanced.error());
   if (auto committed = _database->run("COMMIT"); !committed) return Failure{committed.error()};
   _position = seq;
   for (const std::string& place : batch.value().places) _files.forget(place);
@@ -108,6 +120,9 @@ Result<Batch, StoreError> TableWriter::batchOf(const Taken* begin, const Taken* 
       return Failure{added.error()};
     }
     if (hasID) CopyRow(batch.rows.posts).text("\\x" + message->postID).time(message->time);
+    if (batch.rows.bytes() < kMostRowBytes) continue;
+    if (auto copied = copyRows(batch.rows); !copied) return Failure{copied.error()};
+    batch.rows.clear();
   }
   return batch;
 }
@@ -117,16 +132,15 @@ Result<Done, StoreError> TableWriter::add(const Taken& message, TableRows& rows)
     if (added) return Done();
     return dataFailure(added.error());
   };
-  if (message.subject == subject::kPieces) return _files.write(message.piece, message.body);
+  if (message.subject == subject::kPieces) return _files.write(message.piece, message.body, message.time);
   if (message.subject == subject::kDatagrams) return asData(rows.addDatagram(message));
   if (message.subject == subject::kRefused) {
     rows.addRefused(message, message.reason);
     return Done();
   }
   if (message.subject == subject::kFiles) {
-    const std::string day = timestampText(message.time).substr(0, 10);
-    const auto kept =
-        _files.keep(message.piece, message.body, day, digestOf(message.file, std::to_string(message.seq)));
+    const auto kept = _files.keep(message.piece, message.body,
+                                  digestOf(message.file, std::to_string(message.seq)), message.time);
     if (!kept) return Failure{kept.error()};
     return asData(rows.addFile(message, kept.value()));
   }
@@ -180,13 +194,21 @@ Result<Done, StoreError> TableWriter::copyRows(const TableRows& rows) {
   return Done();
 }
 
-Result<Done, StoreError> TableWriter::advance(std::uint64_t seq) {
+Result<Done, StoreError> TableWriter::advance(Position to) {
   // If another drain has been here, this row is not where it was left, and the transaction is undone.
   const auto moved = _database->run(
-      "UPDATE veltra.position SET seq = $1 WHERE stream = $2 AND created = $3 AND seq = $4 RETURNING seq",
-      {std::to_string(seq), _stream, std::to_string(_created), std::to_string(_position)});
+      "UPDATE veltra.position SET seq = $1, time = $2 WHERE stream = $3 AND created = $4 AND seq = $5 "
+      "RETURNING seq",
+      {std::to_string(to.seq), std::to_string(to.time), _stream, std::to_string(_created),
+       std::to_string(_position)});
   if (!moved) return Failure{moved.error()};
   if (moved.value().size() != 1) return passingFailure("another drain has moved the position");
+  return Done();
+}
+
+Result<Done, StoreError> TableWriter::goBack(std::uint64_t seq) {
+  if (auto moved = advance({seq, 0}); !moved) return moved;
+  _position = seq;
   return Done();
 }
 
@@ -194,6 +216,8 @@ Result<Done, StoreError> TableWriter::forget(double postDays, double keepDays) {
   auto forgotten =
       _database->run("DELETE FROM veltra.posts WHERE received < now() - $1::float8 * interval '1 day'",
                      {std::to_string(postDays)});
+  if (!forgotten) return Failure{forgotten.error()};
+  forgotten = _database->run("DELETE FROM veltra.refused WHERE received < now() - interval '7 days'");
   if (!forgotten) return Failure{forgotten.error()};
   if (keepDays <= 0) return Done();
   forgotten =

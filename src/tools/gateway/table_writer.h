@@ -34,23 +34,33 @@ class TableWriter {
     std::uint64_t refused = 0;
   };
 
-  // Takes the place of the one drain that is active: false if another has it.
-  static Result<bool, StoreError> becomeActive(Database& database);
-  // Makes the tables that are missing.
+  // Takes the place of the one drain of the stream that is active: false if another has it.
+  static Result<bool, StoreError> becomeActive(Database& database, const std::string& stream);
+  // Makes what is missing of tables and views, unless this version of them is there: a statement that
+  // replaces a view would wait for every query of it, and let others wait meanwhile.
   static Result<Done, StoreError> prepare(Database& database);
 
   TableWriter(std::unique_ptr<Database> database, PieceStore& files, std::string stream)
       : _database(std::move(database)), _files(files), _stream(std::move(stream)) {}
 
-  // Everything up to this place of the stream is in the tables. A stream that was made at another time begins
-  // at 0.
-  Result<std::uint64_t, StoreError> position(std::int64_t created);
+  // Everything up to this place of the stream is in the tables.
+  struct Position {
+    std::uint64_t seq = 0;
+    // Of the message at this place, in nanoseconds since 1970; 0: unknown.
+    std::int64_t time = 0;
+  };
+
+  // A stream that was made at another time begins at 0.
+  Result<Position, StoreError> position(std::int64_t created);
+  // What the stream takes next gets places behind `seq`, which is lower than the position.
+  Result<Done, StoreError> goBack(std::uint64_t seq);
   // After an error nothing is written, unless the error came with the commit: ask for the position then.
   Result<Written, StoreError> write(const std::vector<Taken>& messages);
   // Forgets what is older: IDs of posts, and everything else unless `keepDays` is 0.
   Result<Done, StoreError> forget(double postDays, double keepDays);
 
  private:
+  Result<Written, StoreError> writeHalves(const Taken* begin, const Taken* end);
   // With a refusal the messages go to "refused" for this reason.
   Result<Written, StoreError> writeTogether(const Taken* begin, const Taken* end, const std::string& refusal);
   Result<Batch, StoreError> batchOf(const Taken* begin, const Taken* end, std::set<std::string> seen,
@@ -58,7 +68,7 @@ class TableWriter {
   Result<Done, StoreError> add(const Taken& message, TableRows& rows);
   Result<std::set<std::string>, StoreError> knownPosts(const Taken* begin, const Taken* end);
   Result<Done, StoreError> copyRows(const TableRows& rows);
-  Result<Done, StoreError> advance(std::uint64_t seq);
+  Result<Done, StoreError> advance(Position to);
 
   const std::unique_ptr<Database> _database;
   PieceStore& _files;

@@ -23,9 +23,14 @@ bool isBlankOrControl(char c) {
 }
 
 AddressFault noHTTPS(const std::string& address) {
-  const std::size_t colon = address.find("://");
-  const bool hasScheme = colon != std::string::npos;
-  const std::string rest = hasScheme ? address.substr(colon + 3) : address;
+  std::string rest = address;
+  const std::size_t scheme = address.find("://");
+  if (scheme != std::string::npos) rest.erase(0, scheme + 3);
+  // "https:/host", "https//host"
+  const std::size_t slash = std::min(rest.find('/'), rest.size());
+  const std::string word = lowerCase(rest.substr(0, slash));
+  if (word == "http:" || word == "https:" || word == "http" || word == "https")
+    rest.erase(0, std::min(rest.find_first_not_of('/', slash), rest.size()));
   return {FindingName::not_https, "does not begin with https://, and nothing is sent to it",
           fmt::format("Write \"https://{}\".", rest)};
 }
@@ -58,6 +63,8 @@ std::optional<AddressFault> faultOfAddress(const std::string& address) {
       bracket == std::string_view::npos ? authority.size() : authority.find(':', bracket);
   const std::string_view host = authority.substr(0, colon);
   if (host.empty()) return AddressFault{bad_address, "has no host", "Write https://HOST/PATH."};
+  if (host.front() == '.' || host.find("..") != std::string_view::npos)
+    return AddressFault{bad_address, "has a host with a dot too many", "Take the dot out."};
   if (colon != std::string_view::npos && !isPort(authority.substr(colon)))
     return AddressFault{bad_address, "has a port that is none", "Write a port from 1 to 65535, or none."};
   if (http::hostName(address).empty())

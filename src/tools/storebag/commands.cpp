@@ -134,11 +134,15 @@ Outcome sign(const SignRequest& request) {
 }
 
 Outcome verify(const std::string& publicKey, const std::string& file, const std::string& ed25519) {
+  const auto bytes = readBytes(file);
+  return bytes ? verifyBytes(publicKey, file, bytes.value(), ed25519) : refused(bytes.error());
+}
+
+Outcome verifyBytes(const std::string& publicKey, const std::string& file, const std::string& bytes,
+                    const std::string& ed25519) {
   const auto key = publicKeyIn(publicKey, StorebagKey::Kind::rsa);
   if (!key) return refused(key.error());
-  const auto bytes = readBytes(file);
-  if (!bytes) return refused(bytes.error());
-  const auto container = config::parseStorebagContainer(bytes.value());
+  const auto container = config::parseStorebagContainer(bytes);
   if (!container)
     return refused(file + ": the container is no property list: " + container.error().description());
   if (!container.value().signature) return refused(file + ": the text \"signature\" is missing");

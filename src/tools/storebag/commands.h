@@ -49,6 +49,9 @@ Outcome sign(const SignRequest& request);
 // Refuses a container that the daemon would not accept, and says which step fails. `ed25519`: the public key
 // of an Ed25519 signature that must be there, too; empty: none need be.
 Outcome verify(const std::string& publicKey, const std::string& file, const std::string& ed25519 = {});
+// The same of what was read from the file.
+Outcome verifyBytes(const std::string& publicKey, const std::string& file, const std::string& bytes,
+                    const std::string& ed25519 = {});
 // Prints the storebag of a container, without verification, or a bare storebag as JSON.
 Outcome show(const std::string& file, bool compact);
 

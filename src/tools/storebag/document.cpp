@@ -111,7 +111,13 @@ Result<Document, DocumentFailure> readDocument(const std::string& file) {
 }
 
 Result<StorebagDocument, DocumentFailure> readStorebag(const std::string& file) {
-  auto read = readDocument(file);
+  auto bytes = readBytes(file);
+  if (!bytes) return Failure{DocumentFailure{file, std::nullopt, bytes.error(), {}}};
+  return storebagOf(file, std::move(bytes).value());
+}
+
+Result<StorebagDocument, DocumentFailure> storebagOf(const std::string& file, std::string bytes) {
+  auto read = documentOf(file, std::move(bytes));
   if (!read) return Failure{read.error()};
   StorebagDocument bag;
   bag.document = std::move(read).value();

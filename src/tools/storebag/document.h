@@ -53,6 +53,7 @@ struct StorebagDocument {
 
 // The storebag in a signed container, or a bare one.
 Result<StorebagDocument, DocumentFailure> readStorebag(const std::string& file);
+Result<StorebagDocument, DocumentFailure> storebagOf(const std::string& file, std::string bytes);
 
 // What the daemon takes of a storebag: "at most … bytes, … levels and … values".
 std::string boundsOfStorebags();

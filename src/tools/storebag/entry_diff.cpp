@@ -24,6 +24,8 @@ Effect effectOf(bool more, bool less) {
   return more ? Effect::more : less ? Effect::less : Effect::other;
 }
 
+constexpr const char* kFreedText = "; for devices that were held by sampling, the parent session decides now";
+
 std::optional<Value> writtenValue(const Dictionary& dictionary, const std::string& key) {
   const Value* value = dictionary.find(key);
   return value ? std::optional(*value) : std::nullopt;
@@ -228,13 +230,24 @@ void EntryDiff::compareSampling() {
 std::optional<EntryDiff::SharesText> EntryDiff::changedShares(const std::optional<double>& old,
                                                               const std::optional<double>& now) const {
   const double before = shareOf(old), after = shareOf(now);
+  const bool freed = freesHeld({old, now});
+  const char* more = freed ? kFreedText : "";
   if (before != after)
-    return SharesText{effectOf(after > before, after < before), before, after, sharesText(before, after)};
+    return SharesText{effectOf(after > before || freed, after < before), before, after,
+                      sharesText(before, after) + more};
   if (old.has_value() == now.has_value()) return std::nullopt;
   const double overridden = overriddenShare(_old, old), overriddenNow = overriddenShare(_now, now);
   if (overridden == overriddenNow) return std::nullopt;
-  return SharesText{effectOf(overriddenNow > overridden, overriddenNow < overridden), before, after,
-                    overriddenText(overridden, overriddenNow)};
+  return SharesText{effectOf(overriddenNow > overridden || freed, overriddenNow < overridden), before, after,
+                    overriddenText(overridden, overriddenNow) + more};
+}
+
+// With a hierarchy the parent session decides for every device, sampled out or not, but for those that are
+// held by sampling.
+bool EntryDiff::freesHeld(const Thresholds& thresholds) const {
+  const double held = overriddenShare(_old, thresholds.first);
+  return _now.hierarchy != 0 && shareOf(thresholds.first) < held &&
+         overriddenShare(_now, thresholds.second) < held;
 }
 
 // Of the countries that have one before or now, and are listed before and now: old and new threshold.
@@ -264,17 +277,18 @@ void EntryDiff::compareHeld() {
   const double before = shareOf(_old.overrideSampling.value_or(1));
   const double now = shareOf(_now.overrideSampling.value_or(1));
   if (before == now) return;
-  bool more = false, less = false;
+  bool more = false, less = false, freed = false;
   const auto compareWhere = [&](const Thresholds& thresholds) {
     const double old = overriddenShare(_old, thresholds.first);
     const double current = overriddenShare(_now, thresholds.second);
-    more = more || (now > before && current > old);
+    freed = freed || freesHeld(thresholds);
+    more = more || freed || (now > before && current > old);
     less = less || (now < before && current < old);
   };
   compareWhere({_old.samplingThreshold, _now.samplingThreshold});
   for (const auto& [one, thresholds] : countryThresholds()) compareWhere(thresholds);
   say(sampling, effectOf(more, less), "override_sampling",
-      fmt::format("{}: {}", _who, overriddenText(before, now)));
+      fmt::format("{}: {}{}", _who, overriddenText(before, now), freed ? kFreedText : ""));
 }
 
 void EntryDiff::compareIdentifiers() {

@@ -63,6 +63,7 @@ class EntryDiff {
   void compareSampling();
   std::optional<SharesText> changedShares(const std::optional<double>& old,
                                           const std::optional<double>& now) const;
+  bool freesHeld(const Thresholds& thresholds) const;
   std::map<std::string, Thresholds> countryThresholds() const;
   void compareCountryThresholds();
   void compareHeld();

@@ -63,24 +63,41 @@ double chanceOf(const BackendExplanation& told) {
   }
 }
 
-// What filters did: `plain` is the same message without them.
-void compareEvents(const Dictionary& filtered, const Dictionary& plain, const Dictionary& original,
-                   LeavingEvent& told) {
+// What filters did: `plain` is the same message without them. What JSON events cannot carry they may hash,
+// and it does not leave.
+config::EditedFields editsOfFilters(const Dictionary& filtered, const Dictionary& plain,
+                                    const Dictionary& leaving) {
+  config::EditedFields edits;
   for (const auto& [key, value] : plain) {
     const Value* left = filtered.find(key);
-    const Value* first = original.find(key);
-    if (left == nullptr || (!(*left == value) && first && isContainer(*first)))
-      told.removed.insert(key);
-    else if (!(*left == value))
-      told.hashed.insert(key);
+    if (left != nullptr && *left == value) continue;
+    (left != nullptr && leaving.contains(key) ? edits.hashed : edits.removed).insert(key);
   }
+  return edits;
 }
 
-// What the owner's policy did.
 template <typename Told>
 void addEdits(const config::EditedFields& edits, Told& told) {
   told.removed.insert(edits.removed.begin(), edits.removed.end());
   told.hashed.insert(edits.hashed.begin(), edits.hashed.end());
+}
+
+// The user info takes the place of the message's fields of the same name, and filters come last.
+void addLaterEdits(const config::EditedFields& edits, LeavingEvent& told) {
+  for (const auto* names : {&edits.removed, &edits.hashed}) {
+    for (const std::string& name : *names) {
+      told.removed.erase(name);
+      told.hashed.erase(name);
+    }
+  }
+  addEdits(edits, told);
+}
+
+// A field that the user info has lost leaves the message's own in its place.
+config::EditedFields editsOfUserInfo(const DryRun& run, std::size_t message) {
+  config::EditedFields edits = run.userInfoEdits();
+  for (const std::string& name : run.editsOf(message).hashed) edits.removed.erase(name);
+  return edits;
 }
 
 // Takes out of an event what another run would have different.
@@ -112,14 +129,10 @@ void tellEvents(const DryRun& run, const Given& given, const std::string& name,
     const auto withFilters = filtered.events().find(message);
     const auto without = plain.events().find(message);
     if (withFilters == filtered.events().end() || without == plain.events().end()) continue;
-    Dictionary original =
-        message > 0 ? given.messages[message - 1].payload.value_or(Dictionary()) : Dictionary();
-    if (given.userInfo) original.merge(*given.userInfo);
     LeavingEvent left{event, message, {}, {}};
-    compareEvents(withFilters->second, without->second, original, left);
     addEdits(run.editsOf(message), left);
-    addEdits(run.userInfoEdits(), left);
-    for (const std::string& key : left.removed) left.hashed.erase(key);
+    addLaterEdits(editsOfUserInfo(run, message), left);
+    addLaterEdits(editsOfFilters(withFilters->second, without->second, event), left);
     hideFactsOfARun(run, without->second, message, left.fields);
     told.removed.insert(left.removed.begin(), left.removed.end());
     told.hashed.insert(left.hashed.begin(), left.hashed.end());

@@ -5,9 +5,11 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cctype>
 #include <set>
 
 #include "config/storebag_content.h"
+#include "config/storebag_verdict.h"
 #include "storebag/address_check.h"
 #include "storebag/entry_check.h"
 #include "storebag/spelling.h"
@@ -23,10 +25,17 @@ using config::KeyTable;
 using config::KeyType;
 using enum FindingName;
 
-std::vector<std::string> namesOf(const KeyTable& table) {
+std::vector<std::string> namesOf(const KeyTable& table, bool sectionsOnly) {
   std::vector<std::string> names;
-  for (const Key& key : table) names.emplace_back(key.name);
+  for (const Key& key : table)
+    if (!sectionsOnly || key.inner) names.emplace_back(key.name);
   return names;
+}
+
+// As it stands within a sentence; "UDP port" keeps its capitals.
+std::string withinSentence(std::string text) {
+  const bool isWord = text.size() > 1 && std::islower(static_cast<unsigned char>(text[1])) != 0;
+  return isWord ? lowerCase(text.substr(0, 1)) + text.substr(1) : text;
 }
 
 FindingName unknownIn(const KeyTable& table, const Value* value) {
@@ -115,7 +124,7 @@ class Lint {
       }
     }
     const FindingName unknown = unknownIn(table, value);
-    const std::vector<std::string> known = namesOf(table);
+    const std::vector<std::string> known = namesOf(table, unknown == unknown_section);
     const auto meant = closestName(name, known);
     const Key* key = meant ? table.find(*meant) : nullptr;
     _sink.say(
@@ -153,8 +162,7 @@ class Lint {
   void checkRequired(const Spot& at, const Key& key, const Value* value) {
     if (value == nullptr)
       return _sink.say(missing_key, at, fmt::format("no \"{}\": {}", key.name, key.byDefault),
-                       fmt::format("Add \"{}\": {}", key.name,
-                                   lowerCase(std::string(1, key.meaning[0])) + std::string(key.meaning + 1)));
+                       fmt::format("Add \"{}\": {}", key.name, withinSentence(key.meaning)));
     const Array* list = key.type == KeyType::texts ? value->asArray() : nullptr;
     if (list && list->empty())
       _sink.say(missing_key, at.key(key.name),
@@ -212,6 +220,22 @@ class Lint {
   const EntryCheck _entries;
 };
 
+// What devices with the settings for it cannot read.
+void checkClaims(const StorebagDocument& bag, LintSink& sink) {
+  static constexpr std::pair<const char*, const char*> kMends[] = {
+      {"expires", "Write a date like \"2026-12-31\", or with a time: \"2026-12-31T18:00:00Z\"."},
+      {"revoked", "Write the 64 hexadecimal digits that keygen and verify print of a key."}};
+  const auto claims = config::StorebagClaims::of(bag.storebag);
+  for (const auto& [key, mend] : kMends) {
+    const auto said = claims.unreadable.find(key);
+    const bool hasType = said != claims.unreadable.end() &&
+                         config::fits(*bag.storebag.find(key), config::Storebag::kKeys.find(key)->type);
+    if (hasType)
+      sink.say(wrong_type, Spot::top(bag.document.places).key(key),
+               said->second + ": devices that look at it refuse the storebag", mend);
+  }
+}
+
 void checkSignature(const StorebagDocument& bag, LintSink& sink) {
   if (bag.moreSignatures) return;
   const Spot top = Spot::top(bag.document.places);
@@ -229,6 +253,7 @@ void checkSignature(const StorebagDocument& bag, LintSink& sink) {
 std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions& options) {
   Lint lint(options);
   lint.checkDictionary(Spot::top(bag.document.places), bag.storebag, config::Storebag::kKeys);
+  checkClaims(bag, lint.sink());
   checkSignature(bag, lint.sink());
   std::vector<Finding> findings = lint.take();
   std::stable_sort(findings.begin(), findings.end(), [](const Finding& a, const Finding& b) {

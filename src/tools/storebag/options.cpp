@@ -92,14 +92,19 @@ void describeKeys(CLI::App& app, Arguments& given) {
   publish->add_option("--key", given.publish.publicKey, "Public key in DER form that devices have")
       ->type_name("FILE")
       ->capture_default_str();
+  publish
+      ->add_option("--ed25519", given.publish.ed25519,
+                   "Public key whose Ed25519 signature must be there, too, in DER or PEM form")
+      ->type_name("FILE");
   publish->callback([&given] { given.outcome = storebag::publish(given.publish); });
 
   CLI::App* rollback = addCommand(app, "rollback", "Serve again what was published before");
   rollback->positionals_at_end();
-  rollback->add_option("NAME", given.publish.files, "Names of storebags")->required();
-  rollback->add_option("DIR", given.publish.directory, "The folder that is served")->required();
-  rollback->callback(
-      [&given] { given.outcome = storebag::rollback(given.publish.files, given.publish.directory); });
+  rollback->add_option("NAME", given.rollback.names, "Names of storebags")->required();
+  rollback->add_option("DIR", given.rollback.directory, "The folder that is served")->required();
+  rollback->add_flag("--force", given.rollback.force,
+                     "Also if devices can refuse it, for its serial or its date");
+  rollback->callback([&given] { given.outcome = storebag::rollback(given.rollback); });
 
   CLI::App* show = addCommand(app, "show", "Print a storebag as JSON, without verifying it");
   show->add_option("FILE", given.file, "A container or an unsigned storebag")->required();

@@ -18,6 +18,7 @@ struct Arguments {
   bool ed25519Key = false;
   SignRequest sign;
   PublishRequest publish;
+  RollbackRequest rollback;
   LintRequest lint;
   FormatRequest format;
   ExplainRequest explain;

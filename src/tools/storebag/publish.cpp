@@ -1,113 +1,93 @@
 // SPDX-License-Identifier: Apache-2.0
-// Checks storebags and moves them into the folder that is served.
+// Checks storebags before they are served.
 #include "storebag/publish.h"
 
-#include <fcntl.h>
 #include <fmt/format.h>
-#include <sys/stat.h>
-#include <sys/time.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
 #include <ctime>
 #include <filesystem>
 
-#include "config/storebag_container.h"
-#include "platform/file_store.h"
+#include "config/storebag_verdict.h"
 #include "storebag/lint.h"
+#include "storebag/served_folder.h"
 
 namespace veltrad::storebag {
 
 namespace {
 
-namespace fs = std::filesystem;
-
-constexpr unsigned kServedMode = 0644;
-// Of each name.
-constexpr std::size_t kMostKept = 10;
+using config::StorebagClaims;
 
 // One storebag that is about to be published.
 struct Publication {
+  std::string file;
   std::string name;
   std::string bytes;
+  StorebagClaims claims;
 };
 
-std::optional<std::int64_t> serialOf(const Dictionary& storebag) {
-  const Value* serial = storebag.find("serial");
-  return serial ? serial->toInt64() : std::nullopt;
-}
-
-// The numbers under which storebags of the name are kept, the newest last.
-std::vector<std::uint64_t> keptNumbers(const fs::path& folder) {
-  std::vector<std::uint64_t> numbers;
-  std::error_code error;
-  for (const auto& entry : fs::directory_iterator(folder, error)) {
-    const std::string text = entry.path().filename().string();
-    if (!text.empty() && text.size() < 19 && text.find_first_not_of("0123456789") == std::string::npos)
-      numbers.push_back(std::stoull(text));
+// Says what is wrong with the names; empty: nothing.
+std::string faultOfNames(std::vector<std::string> names) {
+  std::sort(names.begin(), names.end());
+  const auto twice = std::adjacent_find(names.begin(), names.end());
+  if (twice != names.end()) return *twice + ": is given twice";
+  for (const std::string& name : names) {
+    if (name.empty() || name.front() == '.' || name.front() == '-' || name.find('/') != std::string::npos)
+      return fmt::format("\"{}\": expected the name of a storebag", name);
   }
-  std::sort(numbers.begin(), numbers.end());
-  return numbers;
-}
-
-fs::path folderBefore(const std::string& directory, const std::string& name) {
-  return fs::path(directory) / ".before" / name;
-}
-
-// "Last-Modified" has whole seconds, so of two within one second a daemon would miss the second.
-std::optional<std::string> makeNewer(const std::string& path, std::time_t than) {
-  const std::time_t time = std::max(std::time(nullptr), than + 1);
-  const timespec times[] = {{time, 0}, {time, 0}};
-  if (::utimensat(AT_FDCWD, path.c_str(), times, 0) == 0) return std::nullopt;
-  return path + ": " + std::strerror(errno);
-}
-
-std::time_t modified(const std::string& path) {
-  struct stat found {};
-  return ::stat(path.c_str(), &found) == 0 ? found.st_mtime : 0;
+  return "";
 }
 
 Result<Publication, std::string> checked(const std::string& file, const PublishRequest& request) {
-  const Outcome verified = verify(request.publicKey, file);
+  auto bytes = readBytes(file);
+  if (!bytes) return Failure{bytes.error()};
+  const Outcome verified = verifyBytes(request.publicKey, file, bytes.value(), request.ed25519);
   if (!verified.done) return Failure{verified.text};
-  const auto bag = readStorebag(file);
+  const auto bag = storebagOf(file, bytes.value());
   if (!bag) return Failure{bag.error().line()};
   if (std::string errors = errorsIn(bag.value()); !errors.empty()) return Failure{std::move(errors)};
-  Publication made{fs::path(file).filename().string(), bag.value().document.bytes};
-  if (made.name.starts_with('.') || made.name.empty())
-    return Failure{file + ": the file's name is to be the storebag's"};
-  const std::string* name = bag.value().storebag.string("name");
-  if (name && *name != made.name)
-    return Failure{
-        fmt::format("{}: the storebag's name is \"{}\", the file's is \"{}\"", file, *name, made.name)};
-  const std::string path = request.directory + "/" + made.name;
-  if (!fs::exists(path)) return made;
-  const auto served = readStorebag(path);
-  const auto before = served ? serialOf(served.value().storebag) : std::nullopt;
-  if (const std::string fault = faultOfSerial(before, serialOf(bag.value().storebag)); !fault.empty())
-    return Failure{file + ": " + fault};
+  Publication made{file, std::filesystem::path(file).filename().string(), std::move(bytes).value(),
+                   StorebagClaims::of(bag.value().storebag)};
+  if (made.claims.name && *made.claims.name != made.name)
+    return Failure{fmt::format("{}: the storebag's name is \"{}\", the file's is \"{}\"", file,
+                               *made.claims.name, made.name)};
   return made;
 }
 
-// The file that is served is kept, then replaced.
-std::optional<std::string> put(const Publication& made, const std::string& directory) {
-  platform::DiskFileStore files;
-  const std::string path = directory + "/" + made.name;
-  const fs::path kept = folderBefore(directory, made.name);
-  const std::time_t before = modified(path);
-  if (const auto served = files.read(path, config::kStorebagMostContainerBytes); served) {
-    const auto numbers = keptNumbers(kept);
-    if (auto folder = platform::makeDirectories(kept.string()); !folder) return folder.error().description;
-    const std::string next = (kept / std::to_string(numbers.empty() ? 1 : numbers.back() + 1)).string();
-    if (auto copied = files.replace(next, served.value(), kServedMode); !copied)
-      return copied.error().description;
-    for (std::size_t at = 0; at + kMostKept <= numbers.size(); ++at)
-      (void)files.unlink((kept / std::to_string(numbers[at])).string());
-  }
-  if (auto replaced = files.replace(path, made.bytes, kServedMode); !replaced)
-    return replaced.error().description;
-  return makeNewer(path, before);
+// What no device takes has no serial that one could have seen.
+std::optional<std::int64_t> serialIn(const std::optional<std::string>& bytes) {
+  if (!bytes) return std::nullopt;
+  const auto bag = storebagOf({}, *bytes);
+  return bag ? StorebagClaims::of(bag.value().storebag).serial : std::nullopt;
+}
+
+// Why devices would refuse it after what is served now; empty: they would not.
+Result<std::string, std::string> faultAfter(const ServedFolder& folder, const std::string& name,
+                                            const StorebagClaims& claims) {
+  const auto served = folder.served(name);
+  if (!served) return Failure{served.error()};
+  if (const auto late = config::refusalOfExpiry(claims.expires, static_cast<double>(std::time(nullptr))))
+    return late->text;
+  return faultOfSerial(serialIn(served.value()), claims.serial);
+}
+
+// The one to go back to, if devices take it or it is forced upon them.
+Result<ServedFolder::Kept, std::string> wayBack(const ServedFolder& folder, const std::string& name,
+                                                bool force) {
+  auto kept = folder.before(name);
+  if (!kept) return Failure{kept.error()};
+  if (!kept.value()) return Failure{folder.pathOf(name) + ": nothing was published before"};
+  if (force) return std::move(*kept.value());
+  const auto bag = storebagOf(name, kept.value()->bytes);
+  if (!bag) return Failure{bag.error().line()};
+  const auto fault = faultAfter(folder, name, StorebagClaims::of(bag.value().storebag));
+  if (!fault) return Failure{fault.error()};
+  if (!fault.value().empty())
+    return Failure{
+        fmt::format("{}: in the one before, {}. Devices can refuse that: sign it anew, with a "
+                    "higher serial or a later date, or use --force",
+                    folder.pathOf(name), fault.value())};
+  return std::move(*kept.value());
 }
 
 }  // namespace
@@ -121,40 +101,44 @@ std::string faultOfSerial(std::optional<std::int64_t> served, std::optional<std:
 
 Outcome publish(const PublishRequest& request) {
   std::vector<Publication> all;
+  std::vector<std::string> names;
   for (const std::string& file : request.files) {
     auto one = checked(file, request);
     if (!one) return {false, one.error()};
+    names.push_back(one.value().name);
     all.push_back(std::move(one).value());
   }
-  if (auto made = platform::makeDirectories(request.directory); !made)
-    return {false, made.error().description};
+  if (std::string fault = faultOfNames(names); !fault.empty()) return {false, std::move(fault)};
+  const auto folder = ServedFolder::open(request.directory, true);
+  if (!folder) return {false, folder.error()};
+  for (const Publication& one : all) {
+    const auto fault = faultAfter(folder.value(), one.name, one.claims);
+    if (!fault) return {false, fault.error()};
+    if (!fault.value().empty()) return {false, one.file + ": " + fault.value()};
+  }
   std::string text;
   for (const Publication& one : all) {
-    if (const auto failure = put(one, request.directory)) return {false, *failure};
-    text += request.directory + "/" + one.name + "\n";
+    if (const auto put = folder.value().put(one.name, one.bytes); !put) return {false, put.error()};
+    text += folder.value().pathOf(one.name) + "\n";
   }
   return {true, std::move(text)};
 }
 
-Outcome rollback(const std::vector<std::string>& names, const std::string& directory) {
-  platform::DiskFileStore files;
-  for (const std::string& name : names) {
-    if (keptNumbers(folderBefore(directory, name)).empty())
-      return {false, fmt::format("{}: nothing was published before {}", directory, name)};
+Outcome rollback(const RollbackRequest& request) {
+  if (std::string fault = faultOfNames(request.names); !fault.empty()) return {false, std::move(fault)};
+  const auto folder = ServedFolder::open(request.directory, false);
+  if (!folder) return {false, folder.error()};
+  std::vector<ServedFolder::Kept> all;
+  for (const std::string& name : request.names) {
+    auto kept = wayBack(folder.value(), name, request.force);
+    if (!kept) return {false, kept.error()};
+    all.push_back(std::move(kept).value());
   }
   std::string text;
-  for (const std::string& name : names) {
-    const std::string path = directory + "/" + name;
-    const fs::path folder = folderBefore(directory, name);
-    const std::string newest = (folder / std::to_string(keptNumbers(folder).back())).string();
-    const std::time_t served = modified(path);
-    const auto bytes = files.read(newest, config::kStorebagMostContainerBytes);
-    if (!bytes) return {false, bytes.error().description};
-    if (auto replaced = files.replace(path, bytes.value(), kServedMode); !replaced)
-      return {false, replaced.error().description};
-    if (const auto failure = makeNewer(path, served)) return {false, *failure};
-    (void)files.unlink(newest);
-    text += path + "\n";
+  for (std::size_t at = 0; at < all.size(); ++at) {
+    const std::string& name = request.names[at];
+    if (const auto put = folder.value().putBack(name, all[at]); !put) return {false, put.error()};
+    text += folder.value().pathOf(name) + "\n";
   }
   return {true, std::move(text)};
 }

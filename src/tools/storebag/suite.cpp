@@ -6,6 +6,7 @@
 
 #include <algorithm>
 
+#include "config/storebag_content.h"
 #include "storebag/document.h"
 #include "storebag/explanation.h"
 #include "storebag/lint_sink.h"
@@ -29,6 +30,14 @@ bool isSame(const Value& a, const Value& b) {
 
 std::string numberOrNull(const std::optional<std::int32_t>& number) {
   return number ? std::to_string(*number) : "null";
+}
+
+std::string unknownBackend(const std::string& name) {
+  std::vector<std::string> known;
+  for (const config::Key& key : config::StorebagSection::kKeys) known.emplace_back(key.name);
+  const auto meant = closestName(name, known);
+  return fmt::format("unknown back end {}{}", quoted(name),
+                     meant ? ": did you mean " + quoted(*meant) + "?" : "");
 }
 
 // Compares one back end with what is expected of it.
@@ -146,6 +155,8 @@ class Suite {
       const Spot spot = at.key("expect").key(backend);
       if (const auto fault = faultOf(rules)) return wrong(spot, *fault);
       const auto found = told.backends.find(backend);
+      if (found == told.backends.end() && !config::StorebagSection::kKeys.find(backend))
+        return wrong(spot, unknownBackend(backend));
       Comparison(backend, found == told.backends.end() ? nullptr : &found->second,
                  read.value().messages.size(), result)
           .compare(spot, *rules.asDictionary());

@@ -5,6 +5,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <cctype>
 #include <charconv>
 #include <cmath>
 #include <iterator>
@@ -63,6 +64,15 @@ std::string mendOfType(const Key& key, const Value& value) {
     return fmt::format("Write one text, with commas between the names: {}.", quoted(joined(*array)));
   if (key.type == KeyType::dictionaries && value.asDictionary()) return "Put it into brackets: [{…}].";
   return fmt::format("Write {}{}.", typeText(key.type), rangeText(key));
+}
+
+// Two letters or three digits, or in a list of texts of which one must occur in the code, a part of them.
+bool fitsCountries(const std::string& name, bool whole) {
+  const auto consistsOf = [&](int (*kind)(int), std::size_t length) {
+    const bool fits = whole ? name.size() == length : name.size() <= length;
+    return fits && std::all_of(name.begin(), name.end(), [kind](unsigned char c) { return kind(c) != 0; });
+  };
+  return consistsOf(std::isalpha, 2) || consistsOf(std::isdigit, 3);
 }
 
 bool isCountry(const Key& key) {
@@ -199,6 +209,14 @@ void ValueCheck::checkText(const Spot& at, const Key& key, const std::string& te
               fmt::format("\"key\" is {} with a blank, which is part of the name: the field leaves in clear",
                           quoted(text)),
               fmt::format("Write {}.", quoted(std::string(bare))));
+  else
+    checkWildcard(at, key, text);
+}
+
+void ValueCheck::checkWildcard(const Spot& at, const Key& key, const std::string& name) const {
+  if (name.find('*') != std::string::npos)
+    _sink.say(FindingName::wildcard, at,
+              fmt::format("\"{}\" holds {}, which is compared letter by letter", key.name, quoted(name)));
 }
 
 void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& name) const {
@@ -212,12 +230,17 @@ void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& na
         fmt::format("\"{}\" holds {} with a blank, which is part of the name", key.name, quoted(name)),
         anywhere && bare == name ? "Put each country into quotes of its own: [\"US\", \"CA\"]."
                                  : fmt::format("Write {}.", quoted(std::string(bare))));
+  if (!isCountry(key)) return checkWildcard(at, key, name);
+  const bool isThreshold = key.name == std::string_view("country");
+  if (!fitsCountries(name, isThreshold))
+    return _sink.say(
+        FindingName::country_never_fits, at,
+        fmt::format("\"{}\" holds {}, and no locale has such a country", key.name, quoted(name)));
   const bool hasSmall = std::any_of(name.begin(), name.end(), [](char c) { return c >= 'a' && c <= 'z'; });
-  if (!isCountry(key) || !hasSmall) return;
+  if (!hasSmall) return;
   std::string capital = name;
   for (char& c : capital)
     if (c >= 'a' && c <= 'z') c = static_cast<char>(c - 'a' + 'A');
-  const bool isThreshold = key.name == std::string_view("country");
   _sink.say(FindingName::country_case, at,
             fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", key.name, quoted(name),
                         isThreshold ? "this threshold is never used"

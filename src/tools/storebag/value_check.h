@@ -27,6 +27,7 @@ class ValueCheck {
   void checkNames(const Spot& at, const config::Key& key, const std::string& text) const;
   void checkTexts(const Spot& at, const config::Key& key, const Array& texts) const;
   void checkText(const Spot& at, const config::Key& key, const std::string& text) const;
+  void checkWildcard(const Spot& at, const config::Key& key, const std::string& name) const;
   void checkName(const Spot& at, const config::Key& key, const std::string& name) const;
   void checkAddress(const Spot& at, const config::Key& key, const std::string& address) const;
 

@@ -2,9 +2,13 @@
 // What a request's head decides, and what a datagram becomes.
 #include <gmock/gmock.h>
 
+#include "base/property_list.h"
 #include "formats/json.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
+#include "gateway/received_body.h"
+#include "gateway/table_rows.h"
+#include "support/gzip.h"
 
 namespace veltrad::gateway {
 namespace {
@@ -85,6 +89,107 @@ TEST(Door, ReadsWhatTheRequestSays) {
   EXPECT_EQ(file.value().query.at("description"), "Callwyn QBSL");
 }
 
+// A door whose stream cannot be reached, with little room.
+class Room : public testing::Test {
+ protected:
+  static constexpr std::size_t kHeldBytes = 2u << 20;
+
+  Room()
+      : publisher(Publisher::open(unreachable(), {.bytes = kHeldBytes}, metrics).value()),
+        door(*publisher, metrics,
+             {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429) {}
+  // No completion comes after what it uses.
+  ~Room() override { publisher.reset(); }
+
+  static StreamOptions unreachable() {
+    StreamOptions options;
+    options.servers = {"nats://127.0.0.1:1"};
+    return options;
+  }
+  // The taker, or nothing: refused with 429.
+  std::unique_ptr<BodyTaker> open(const FakeHead& head) {
+    auto handled = door.request(head);
+    if (auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled)) return std::move(*taker);
+    EXPECT_EQ(std::get<Answer>(handled).status, 429);
+    return nullptr;
+  }
+  // The status of the refusal; 0: the whole is held.
+  static int post(BodyTaker& taker, std::string_view body) {
+    while (!body.empty()) {
+      if (const auto refusal = taker.take(body)) return refusal->status;
+    }
+    const auto status = std::make_shared<int>(0);
+    taker.finish([status](const Answer& answer) { *status = answer.status; });
+    return *status;
+  }
+
+  Metrics metrics;
+  std::unique_ptr<Publisher> publisher;
+  Door door;
+  const FakeHead upload = head("/upload?sequence=1", {{"Content-Encoding", "gzip"}});
+};
+
+TEST_F(Room, OfEventsIsNotTakenByFiles) {
+  auto large = open(upload);
+  ASSERT_TRUE(large);
+  EXPECT_FALSE(open(upload));
+  FakeHead small = upload;
+  small.bytes = 1'000;
+  EXPECT_TRUE(open(small)) << "what it can keep at most is known";
+  EXPECT_TRUE(open(head("/events")));
+  large.reset();
+  EXPECT_TRUE(open(upload));
+}
+
+TEST_F(Room, IsTakenByWhatABodyKeeps) {
+  const std::string start = R"({"clientId":"c","events":[]})";
+  const auto first = open(head("/events")), second = open(head("/events"));
+  EXPECT_EQ(post(*first, start + std::string(40'000, ' ')), 0);
+  EXPECT_EQ(post(*second, start + std::string(40'000, ' ') + "\n"), 429);
+  const auto packed = open(head("/events", {{"Content-Encoding", "gzip"}}));
+  EXPECT_FALSE(packed) << "the first is held still, and zlib needs more than is left";
+  EXPECT_EQ(publisher->held(), 1u);
+}
+
+TEST_F(Room, IsGivenBackByABodyThatBecomesAMessage) {
+  Refusals refusals(*publisher, metrics, 429);
+  const DoorServices services{*publisher, metrics, refusals, {}};
+  ByteBudget budget(1'000'000);
+  ReceivedBody body(services, Charge(budget), false, 900'000);
+  const std::string text(900'000, 'x');
+  std::string_view bytes = text;
+  EXPECT_FALSE(body.add(bytes));
+  Charge other(budget);
+  EXPECT_FALSE(other.to(200'000));
+  EXPECT_TRUE(body.becomes(Message()));
+  EXPECT_TRUE(other.to(200'000));
+  EXPECT_LT(body.text().capacity(), 100u);
+}
+
+TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
+  for (const auto& [length, status] : {std::pair(16'000u, 0), {17'000u, 413}}) {
+    const auto list = writeBinaryPropertyList(Array{std::string(length, '\x01')});
+    EXPECT_EQ(post(*open(head("/logdata")), list), status) << length;
+  }
+}
+
+TEST_F(Room, EndsAFileOfWhichAPieceWasNotTaken) {
+  std::string content;
+  for (std::uint32_t number = 1; content.size() < 3 * kHeldBytes; number = number * 1'664'525 + 1'013'904'223)
+    content += static_cast<char>(number >> 24);
+  const std::string packed = *support::GzipCompressor().gzipDeflate({content}, 1);
+  std::string_view rest = packed;
+  const auto taker = open(upload);
+  std::optional<Answer> refusal;
+  while (!refusal && !rest.empty()) {
+    std::string_view piece = rest.substr(0, 10'000);
+    rest.remove_prefix(piece.size());
+    while (!refusal && !piece.empty()) refusal = taker->take(piece);
+  }
+  EXPECT_EQ(refusal.value_or(Answer()).status, 429);
+  EXPECT_EQ(publisher->held(), 2u) << "of 960 KiB each";
+}
+
 TEST(Datagrams, BecomeTheSameMessageWheneverTheyAreSent) {
   // Version 2, component 6, kind 1, 123456 µs; 1400000000 s; session 4660, client 3; 20 bytes of text; 5/10;
   // number 7, reliable.
@@ -103,6 +208,19 @@ TEST(Datagrams, BecomeTheSameMessageWheneverTheyAreSent) {
   EXPECT_EQ(fields.uint32("eventNumber"), 7u);
   EXPECT_EQ(fields.real("time"), 1400000000.12);
   EXPECT_EQ(*fields.dictionary("fields"), (Dictionary{{"a", "1"}, {"b", "x=y"}, {"c", "z z"}, {"d", ""}}));
+}
+
+TEST(Datagrams, StandInTheTableWhateverTheirItemsAreCalled) {
+  std::string header("\x02\x06\x01\x1e\x53\x72\x4e\x00\xff\xff\xed\xcb\xff\xfc\xff\xab\x00\x05\x00\x0a", 20);
+  header += std::string(40, 'd') + std::string("\x00\x07\x00\x01", 4);
+  for (const char* item : {"$date=5", "$data=YQ==", "$date=", "a=1"}) {
+    Taken message;
+    message.body = messageOfDatagram(header + " " + item).body;
+    TableRows rows;
+    ASSERT_TRUE(rows.addDatagram(message).ok()) << item;
+    const std::string_view key(item, std::string_view(item).find('='));
+    EXPECT_THAT(rows.datagrams, testing::HasSubstr("{\"" + std::string(key) + "\":\"")) << item;
+  }
 }
 
 }  // namespace

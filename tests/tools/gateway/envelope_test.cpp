@@ -6,6 +6,7 @@
 
 #include "base/text.h"
 #include "formats/json.h"
+#include "gateway/clean_json.h"
 #include "gateway/table_rows.h"
 
 namespace veltrad::gateway {
@@ -43,6 +44,21 @@ TEST(Envelope, IsRefusedForWhatNoTableTakes) {
     ASSERT_FALSE(envelope.ok()) << text;
     EXPECT_THAT(envelope.error(), HasSubstr(why)) << text;
   }
+}
+
+TEST(Envelope, HasABoundOfEvents) {
+  std::string events = "{}";
+  for (std::size_t i = 1; i < kMostEvents; ++i) events += ",{}";
+  EXPECT_EQ(parseEnvelope(withEvent(events)).value().events.size(), kMostEvents);
+  EXPECT_THAT(parseEnvelope(withEvent(events + ",{}")).error(), HasSubstr("65537 events"));
+}
+
+TEST(Envelope, HasABoundOfValues) {
+  // What stands before counts for six.
+  std::string text = R"({"clientId":"c","events":[],"more":[1)";
+  for (std::size_t i = 6; i < kMostValues; ++i) text += ",1";
+  EXPECT_TRUE(parseEnvelope(text + "]}").ok());
+  EXPECT_THAT(parseEnvelope(text + ",1]}").error(), HasSubstr("more than 500000 values"));
 }
 
 TEST(Envelope, KeepsCharactersThatADatabaseTakes) {

@@ -7,6 +7,7 @@
 
 #include "gateway/drain.h"
 #include "gateway/refusals.h"
+#include "gateway/stream.h"
 
 namespace veltrad::gateway {
 namespace {
@@ -47,6 +48,10 @@ TEST_F(Held, ArePublishedAgainUntilTheyAreTakenOrTooLate) {
   }
   held.refused(1, now);
   EXPECT_EQ(held.next(), now + 250ms);
+  for (const auto wait : {500ms, 1000ms, 2000ms, 4000ms, 4000ms}) {
+    held.refused(1, now);
+    EXPECT_EQ(held.next(), now + wait);
+  }
   held.allDue(now);
   EXPECT_THAT(due(), ElementsAre("a"));
   now += 11'999ms;
@@ -86,6 +91,20 @@ TEST_F(Held, EndWhenTheProcessEnds) {
   EXPECT_EQ(told.size(), 1u);
 }
 
+TEST(Answers, OfTheStreamSayWhetherItHasTheMessage) {
+  const std::pair<const char*, const char*> rows[] = {
+      {R"({"stream":"VELTRA","seq":7})", ""},
+      {R"({"stream":"VELTRA","seq":7,"duplicate":true})", ""},
+      {R"({"stream":"VELTRA","seq":0,"duplicate":true})", "an answer without a place in the stream"},
+      {R"({"stream":"VELTRA"})", "an answer without a place in the stream"},
+      {R"({"error":{"code":503,"description":"maximum bytes exceeded"},"seq":0})", "maximum bytes exceeded"},
+      {R"({"error":{"code":503}})", "an error without a description"},
+      {"[]", "an answer that is no object"},
+      {"+OK", "an answer that is no object"},
+  };
+  for (const auto& [answer, why] : rows) EXPECT_EQ(refusalInAnswer(answer), why) << answer;
+}
+
 TEST(PurgePlan, WaitsForTheIDsToBeForgotten) {
   PurgePlan plan(150s);
   PurgePlan::Time now{1h};
@@ -95,6 +114,17 @@ TEST(PurgePlan, WaitsForTheIDsToBeForgotten) {
   EXPECT_EQ(plan.due(now + 150s), 10u);
   EXPECT_EQ(plan.due(now + 200s), std::nullopt);
   EXPECT_EQ(plan.due(now + 250s), 20u);
+}
+
+TEST(LostTail, IsCertainWhenTheStreamStaysBehindTheTables) {
+  LostTail lost;
+  const LostTail::Time now{1h};
+  const std::tuple<std::chrono::seconds, std::uint64_t, bool> rows[] = {
+      {0s, 10, false}, {5s, 9, false},  {24s, 9, false}, {24s, 10, false},
+      {25s, 9, false}, {44s, 8, false}, {45s, 9, true},
+  };
+  for (const auto& [after, last, certain] : rows)
+    EXPECT_EQ(lost.isCertain(10, last, now + after), certain) << after.count();
 }
 
 TEST(KeepingRate, IsTenASecond) {

@@ -2,19 +2,24 @@
 // veltra-storebag's commands on real files: what it makes, the daemon's own code must take.
 #include "storebag/commands.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <sys/file.h>
 
 #include <filesystem>
+#include <optional>
 #include <utility>
 
 #include "base/base64.h"
+#include "base/file_descriptor.h"
 #include "config/storebag_container.h"
 #include "config/storebag_signing.h"
 #include "fakes/temporary_directory.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "storebag/publish.h"
+#include "storebag/served_folder.h"
 
 namespace veltrad {
 namespace {
@@ -118,6 +123,7 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
   EXPECT_GE(time(), firstTime + std::chrono::seconds(1)) << "a daemon that has the first would get 304";
   const std::string second = read("served/quindle");
   EXPECT_NE(first, second);
+  ASSERT_TRUE(publish(path("quindle")).done) << "the same again";
 
   std::filesystem::create_directories(path("broken"));
   std::string broken = second;
@@ -130,11 +136,90 @@ TEST_F(StorebagCommands, PublishKeepsWhatWasServedAndRefusesWhatDevicesWould) {
   EXPECT_EQ(read("served/quindle"), second);
 
   const auto secondTime = time();
-  ASSERT_TRUE(storebag::rollback({"quindle"}, path("served")).done);
+  EXPECT_THAT(refusal(storebag::rollback({{"quindle"}, path("served")})),
+              HasSubstr("serial 4 is lower than 5, which is served. Devices can refuse that"));
+  EXPECT_EQ(read("served/quindle"), second);
+  ASSERT_TRUE(storebag::rollback({{"quindle"}, path("served"), true}).done);
   EXPECT_EQ(read("served/quindle"), first);
   EXPECT_GE(time(), secondTime + std::chrono::seconds(1));
-  EXPECT_THAT(refusal(storebag::rollback({"quindle"}, path("served"))),
+  EXPECT_THAT(refusal(storebag::rollback({{"quindle"}, path("served"), true})),
               HasSubstr("nothing was published before"));
+}
+
+TEST_F(StorebagCommands, RollbackFindsTheWayBackWhateverWasRepeated) {
+  const auto publish = [this](const std::string& version) {
+    Dictionary bag = kStorebag;
+    bag.set("version", version);
+    const std::string in = file("bag.json", formats::writeJSON(bag));
+    EXPECT_TRUE(storebag::sign({privateKey, in, path("quindle"), false}).done);
+    const Outcome outcome = storebag::publish({{path("quindle")}, path("served"), publicKey});
+    EXPECT_TRUE(outcome.done) << outcome.text;
+    return read("served/quindle");
+  };
+  const auto rollback = [this] { return storebag::rollback({{"quindle"}, path("served")}); };
+  const std::string first = publish("1");
+  const auto time = std::filesystem::last_write_time(path("served/quindle"));
+  EXPECT_EQ(publish("1"), first);
+  EXPECT_EQ(std::filesystem::last_write_time(path("served/quindle")), time) << "devices would fetch it again";
+  EXPECT_THAT(refusal(rollback()), HasSubstr("nothing was published before"));
+  const std::string second = publish("2");
+  // As a publication leaves it whose second half failed, and as a rollback does that was killed.
+  file("served/.before/quindle/2", second);
+  ASSERT_TRUE(rollback().done);
+  EXPECT_EQ(read("served/quindle"), first);
+  publish("3");
+  publish("3");
+  ASSERT_TRUE(rollback().done);
+  EXPECT_EQ(read("served/quindle"), first);
+}
+
+TEST_F(StorebagCommands, PublishAndRollbackDoNothingOrAll) {
+  const std::string bag = file("bag.json", formats::writeJSON(kStorebag));
+  std::filesystem::create_directories(path("other"));
+  const auto signedAs = [&](const std::string& name, const char* expires = nullptr) {
+    storebag::SignRequest request{privateKey, bag, path(name), false};
+    if (expires) request.expires = expires;
+    EXPECT_TRUE(storebag::sign(request).done);
+    return path(name);
+  };
+  const std::string served = path("served"), good = signedAs("mivo"), late = signedAs("late", "2001-01-01");
+  const auto publish = [&](const std::vector<std::string>& files) {
+    return storebag::publish({files, served, publicKey});
+  };
+  EXPECT_THAT(refusal(publish({good, signedAs("other/mivo")})), HasSubstr("mivo: is given twice"));
+  EXPECT_FALSE(std::filesystem::exists(served));
+  EXPECT_THAT(refusal(publish({good, late})), HasSubstr("late: expired on 2001-01-01"));
+  ASSERT_TRUE(storebag::keygen(path("keys"), 0, true).done);
+  EXPECT_THAT(refusal(storebag::publish({{good}, served, publicKey, path("keys/ed25519.der")})),
+              HasSubstr("no Ed25519 signature"));
+  EXPECT_FALSE(std::filesystem::exists(served + "/mivo"));
+  // What cannot be read says nothing about its serial.
+  std::filesystem::create_directories(served + "/mivo");
+  EXPECT_THAT(refusal(publish({good})), HasSubstr("not a regular file"));
+  std::filesystem::remove(served + "/mivo");
+  file("served/mivo", "no storebag");
+  ASSERT_TRUE(publish({good}).done);
+
+  const std::pair<std::vector<std::string>, const char*> names[] = {
+      {{"mivo", "mivo"}, "mivo: is given twice"},
+      {{"../served/mivo"}, "expected the name of a storebag"},
+      {{"mivo", "nothing"}, "served/nothing: nothing was published before"}};
+  for (const auto& [given, reason] : names) {
+    EXPECT_THAT(refusal(storebag::rollback({given, served, true})), HasSubstr(reason));
+    EXPECT_NE(read("served/mivo"), "no storebag");
+  }
+  EXPECT_THAT(refusal(storebag::rollback({{"mivo"}, path("nowhere")})),
+              HasSubstr("nothing was published there"));
+  EXPECT_FALSE(std::filesystem::exists(path("nowhere")));
+}
+
+TEST_F(StorebagCommands, OneHasTheFolderAtATime) {
+  std::optional folder(storebag::ServedFolder::open(path("served"), true));
+  ASSERT_TRUE(folder->ok());
+  const FileDescriptor other(::open(path("served/.before").c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  EXPECT_NE(::flock(other.get(), LOCK_EX | LOCK_NB), 0);
+  folder.reset();
+  EXPECT_EQ(::flock(other.get(), LOCK_EX | LOCK_NB), 0);
 }
 
 TEST_F(StorebagCommands, SignWritesWhatARolloutNeedsAndSignsTwice) {

@@ -109,6 +109,12 @@ const Mistake kMistakes[] = {
      "\"action\": \"remove\"}, ¶{\"key\": \"a\", \"action\": \"remove\", \"method\": 7}",
      "filter-undone-by-flush", "{\"key\": \"a\", \"action\": \"remove\"}"},
     {"{\"country\": [\"CA\"]", "{¶\"country\": [\"ca\"]", "country-case", "\"CA\""},
+    {"\"key\": \"peer\"", "¶\"key\": \"*\"", "wildcard", "each field"},
+    {"\"phone,lamp\"", "\"phone*\"", "wildcard", "everyone"},
+    {"\"https://c.example:8443/e?x=@\"", "\"https:/c.example/e\"", "not-https", "\"https://c.example/e\""},
+    {"\"https://c.example:8443/e?x=@\"", "\"https://c..example/e\"", "bad-address", "dot"},
+    {"[\"US\", \"CA\"]", "[\"US\", \"en_CA\"]", "country-never-fits", "\"US\""},
+    {"{\"country\": [\"CA\"]", "{¶\"country\": [\"C\"]", "country-never-fits", "not \"USA\""},
     {"\"sampling_threshold\": 0.5", "¶\"override_dnu\": 1, \"sampling_threshold\": 0.5", "overrides-consent",
      "key out"},
     {"\"action\": \"remove\"}",
@@ -177,7 +183,7 @@ TEST(Lint, FindsEachMistakeWithItsPlaceAndMend) {
 
 TEST(Lint, FindsAllAtOnceAlsoInsideWhatIsMisnamed) {
   const StorebagDocument bag = bagOf(R"({
-  "versoin": "1",
+  "versoin": "1", "expires": "31.12.2026", "revoked": ["ab"],
   "releese": {
     "dashbord": {"ip": "collector.example", "port": 70000, "reliable": true, "pott": 1},
     "httppost": {"clients": [3, {
@@ -187,6 +193,9 @@ TEST(Lint, FindsAllAtOnceAlsoInsideWhatIsMisnamed) {
   "seed": {"dashboard": {"ip": "192.0.2.7", "port": "${dashboardPort}", "reliable": 49}}
 })");
   EXPECT_EQ(summaryOf(lintStorebag(bag)), R"(2:3 unknown-key versoin
+2:19 wrong-type expires
+2:19 sha1-alone expires
+2:44 wrong-type revoked
 3:3 unknown-section releese
 4:5 unknown-backend releese.dashbord
 4:5 reports-without-consent releese.dashbord

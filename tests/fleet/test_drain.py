@@ -1,0 +1,117 @@
+# SPDX-License-Identifier: Apache-2.0
+"""What the drain makes of messages that no gateway has put into the stream, and of a database or a stream that is not as usual."""
+import os
+import pathlib
+import re
+import signal
+import socket
+import subprocess
+import time
+import urllib.request
+
+import side
+from devices import GZIP, FleetTest, envelope, packed, post_id
+
+
+class Drain(FleetTest):
+    def metric(self, name):
+        text = urllib.request.urlopen(self.line["drain"] + "/metrics", timeout=5).read().decode()
+        return float(re.search(rf"^{name} (\S+)$", text, re.M)[1])
+
+    def talk(self, *lines):
+        """Says something to a server of the stream in its own protocol, and waits until it has been read."""
+        with socket.create_connection(("127.0.0.1", self.fleet.facts["streams"]["stream1"][0]), 10) as link:
+            link.sendall(b'CONNECT {"verbose":false,"headers":true}\r\n' + b"".join(lines) + b"PING\r\n")
+            answer = link.makefile("rb")
+            while answer.readline().strip() != b"PONG":
+                pass
+
+    def put(self, subject, body, **headers):
+        head = "NATS/1.0\r\n" + "".join(f"{name.replace('_', '-')}: {text}\r\n" for name, text in headers.items()) + "\r\n"
+        self.talk(f"HPUB veltra.{subject} {len(head)} {len(head) + len(body)}\r\n{head}".encode() + body + b"\r\n")
+
+    def end(self, name, number=signal.SIGKILL):
+        pid = self.fleet.facts["pids"][name]
+        self.fleet.kill(name, number)
+        side.wait_until(lambda: not side.alive(pid), f"the end of {name}")
+
+    def holds(self, sql, relation):
+        """A session of the database that stays within a transaction."""
+        session = subprocess.Popen([side.program("psql"), "-qXAt", "-c", f"{sql}; SELECT pg_sleep(600)", self.fleet.dsn],
+                                   stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+        self.addCleanup(session.wait)
+        self.addCleanup(session.kill)
+        side.wait_until(lambda: self.fleet.query(f"SELECT 1 FROM pg_locks WHERE relation = '{relation}'::regclass AND granted"
+                                                 " AND pid != pg_backend_pid()"), "its lock")
+        return session
+
+    def test_what_no_table_takes_is_kept_apart_and_holds_nothing_up(self):
+        for subject, body, headers in (("events", b"{", {}), ("events", envelope({}), {"Veltra_Piece": "abc 100"}),
+                                       ("files", b"x", {}), ("files", b"x", {"Veltra_File": "{}", "Veltra_Piece": "abc 1"}),
+                                       ("logdata", b"[", {"Veltra_Location": "/logdata/1"}), ("datagrams", b"{}", {}),
+                                       ("pieces", b"x", {"Veltra_Piece": "../x 0"}), ("other", b"x", {})):
+            self.put(subject, body, **headers)
+        self.assertEqual(self.direct().post("/events", envelope({}, client="behind")).status, 200)
+        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'behind'", 1)
+        self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.refused WHERE reason LIKE 'drain: %'")), 8)
+
+    def test_a_post_is_written_once_however_late_it_comes_again(self):
+        before, identifier = self.metric("veltra_drain_skipped_total"), post_id()
+        for _ in range(2):  # without an ID that the stream knows, as after its two minutes
+            self.put("events", envelope({}, client="late"), Veltra_Post_ID=identifier)
+        side.wait_until(lambda: self.metric("veltra_drain_skipped_total") == before + 1, "the second is skipped")
+        self.assertEqual(len(self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'late'", 1)), 1)
+
+    def test_what_took_the_places_of_lost_messages_is_read(self):
+        self.assertEqual(self.direct().post("/events", envelope({}, client="before")).status, 200)
+        side.wait_until(self.fleet.is_carried, "it is in the table")
+        self.end("drain")
+        # As if the tables had three more, which the servers lost with their power.
+        self.fleet.query("UPDATE veltra.position SET seq = seq + 3, time = (extract(epoch FROM clock_timestamp()) * 1e9)::bigint")
+        for number in range(5):
+            self.assertEqual(self.direct().post("/events", envelope({"n": number}, client="after")).status, 200)
+        self.fleet.start(["drain"])
+        self.assertEqual(len(self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'after'", 5)), 5)
+        self.assertEqual(len(self.fleet.query("SELECT 1 FROM veltra.events WHERE client_id = 'before'")), 1)
+
+    def test_what_waits_is_known_while_the_database_is_away(self):
+        self.end("postgres")
+        for number in range(3):
+            self.assertEqual(self.direct().post("/events", envelope({"n": number}, client="waits")).status, 200)
+        side.wait_until(lambda: self.metric("veltra_drain_lag_messages") >= 3 and self.metric("veltra_drain_lag_seconds") > 1, "the lag")
+        self.fleet.start(["postgres"])
+        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'waits'", 3)
+        side.wait_until(lambda: self.metric("veltra_drain_lag_messages") == 0, "no lag")
+
+    def test_queries_of_views_do_not_keep_it_from_starting(self):
+        self.holds("SELECT count(*) FROM veltra.sessions", "veltra.sessions")
+        self.end("drain")
+        self.fleet.start(["drain"])
+
+    def test_it_ends_in_time_also_if_the_database_does_not_answer(self):
+        session = self.holds("LOCK TABLE veltra.position", "veltra.position")
+        self.assertEqual(self.direct().post("/events", envelope({}, client="locked")).status, 200)
+        side.wait_until(lambda: self.fleet.query("SELECT 1 FROM pg_locks WHERE NOT granted"), "the drain waits")
+        begin = time.monotonic()
+        self.end("drain", signal.SIGTERM)
+        self.assertLess(time.monotonic() - begin, 15)
+        session.kill()
+        self.fleet.query("SELECT pg_terminate_backend(pid) FROM pg_locks WHERE relation = 'veltra.position'::regclass")
+        self.fleet.start(["drain"])
+        self.assertEqual(len(self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'locked'", 1)), 1)
+
+    def test_a_large_file_does_not_fill_the_memory(self):
+        self.end("drain")
+        body = packed(os.urandom(1 << 20) * 80)  # a gzip stream does not see so far back
+        answer = self.direct().request("POST", "/upload?uuid=large&sequence=1&filename=f.gz&raw=true", body, GZIP)
+        self.assertEqual(answer.status, 200, answer)
+        self.fleet.start(["drain"])
+        self.rows("SELECT 1 FROM veltra.files WHERE uuid = 'large'", 1)
+        status = pathlib.Path(f"/proc/{self.fleet.facts['pids']['drain']}/status").read_text()
+        self.assertLess(int(re.search(r"^VmHWM:\s+(\d+)", status, re.M)[1]), 128 << 10)
+        self.assertEqual(self.metric("veltra_drain_restarts_total"), 0)
+
+    def test_a_stream_that_was_made_anew_is_read_from_its_start(self):
+        self.talk(b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
+        side.wait_until(lambda: self.direct().post("/events", envelope({}, client="anew")).status == 200, "a new stream")
+        self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'anew'", 1)
