@@ -84,8 +84,8 @@ struct OperatorChoices {
 };
 
 // A file that is broken, unreadable or holds a value of a wrong type or out of its range is one error line a
-// change, and the last good content stands. A key that is unknown or has no effect, and further ones of
-// "keys", are one warning a change.
+// change, and the last good content stands. A key that is unknown, and further ones of "keys", are one
+// warning a change.
 class OperatorSettings final : public SettingsFollower<OperatorChoices> {
  public:
   // `path`: of either form. What holds is null while the file has never been good, or could not be read yet.

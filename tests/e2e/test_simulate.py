@@ -18,7 +18,7 @@ class Page(unittest.TestCase):
         self.addCleanup(folder.cleanup)
         page = pathlib.Path(folder.name) / "fleet.md"
         done = subprocess.run([SOURCE / "fleet/simulate", "--devices", "600", "--page", str(page)], capture_output=True, text=True,
-                              env={"VELTRA_BUILD": str(BUILD), "PATH": "/usr/bin:/bin"}, timeout=300)
+                              env={"VELTRA_BUILD": str(BUILD), "PATH": "/usr/bin:/bin"}, timeout=600)
         self.assertEqual(done.returncode, 0, done.stderr)
         text, committed = page.read_text(), (SOURCE / "docs/fleet.md").read_text()
         parts = dict(re.findall(r"<!-- made: (\w+) -->\n(.*?)<!-- end -->", text, re.S))

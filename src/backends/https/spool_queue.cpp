@@ -8,7 +8,7 @@
 
 #include "backends/https/spool_verdicts.h"
 #include "platform/clock.h"
-#include "platform/uuid.h"
+#include "platform/random.h"
 
 namespace veltrad::backends {
 
@@ -18,13 +18,6 @@ namespace {
 
 double steadyNow() {
   return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
-}
-
-// In [0, 1); another sequence in each process, so that a fleet does not come at once.
-double jitter() {
-  const auto bytes = platform::randomUUID();
-  const unsigned number = bytes[0] | unsigned{bytes[1]} << 8 | unsigned{bytes[2]} << 16;
-  return number / double{1u << 24};
 }
 
 // Of posts that could not be read yet.
@@ -88,7 +81,8 @@ void SpoolQueue::landed(std::uint64_t order, const std::string& address, bool an
 
 void SpoolQueue::failed(const std::string& address, const http::HTTPResult& result) {
   const Lock held(_mutex);
-  _waits[numberOf(address)].failed(steadyNow(), false, retryAfterOf(result), jitter(), outcomeOf(result));
+  _waits[numberOf(address)].failed(steadyNow(), false, retryAfterOf(result), platform::kernelUniform(),
+                                   outcomeOf(result));
 }
 
 bool SpoolQueue::add(Place place, const std::string& address, std::uint32_t uid, std::uint64_t emptied) {
@@ -114,7 +108,7 @@ void SpoolQueue::addLoaded(Place place, const std::string& address, std::uint32_
   _index.add(place);
   _lastOrder = std::max(_lastOrder, place.name.order);
   SpoolWait& wait = _waits[place.address];
-  if (!wait.failing()) wait.failed(steadyNow(), false, 0, jitter(), lastError);
+  if (!wait.failing()) wait.failed(steadyNow(), false, 0, platform::kernelUniform(), lastError);
 }
 
 void SpoolQueue::addUnread(const Name& name, std::uint32_t bytes) {
@@ -243,7 +237,7 @@ std::optional<SpoolQueue::Place> SpoolQueue::tried(std::uint64_t order, const ht
     wait.succeeded();
     remove(*found);
   } else if (tellsOfServer(result)) {
-    wait.failed(steadyNow(), true, retryAfterOf(result), jitter(), std::move(outcome));
+    wait.failed(steadyNow(), true, retryAfterOf(result), platform::kernelUniform(), std::move(outcome));
   } else {
     wait.postponed(steadyNow() + kUntilThereIsRoom);
   }
@@ -260,7 +254,7 @@ void SpoolQueue::putBack(std::uint64_t order, double seconds) {
 
 void SpoolQueue::woken() {
   const Lock held(_mutex);
-  for (SpoolWait& wait : _waits) wait.woken(steadyNow(), jitter());
+  for (SpoolWait& wait : _waits) wait.woken(steadyNow(), platform::kernelUniform());
 }
 
 std::size_t SpoolQueue::hurry() {
