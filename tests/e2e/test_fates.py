@@ -178,6 +178,7 @@ class Fates(FatesTest):
             self.lab.control(path="/dashboard", ack="drop")
             for number in range(3, 30):  # more than there are sockets
                 shot(number)
+            self.lab.received("dashboard", 29)  # what the lab reads after its reset is acknowledged
             self.lab.reset()
             shot(30)
             unsure = ("acknowledged", "acknowledged_by_number")
