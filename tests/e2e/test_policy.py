@@ -231,6 +231,41 @@ class Policy(PolicyTest):
                     dashboard.recv(2000)
             self.assertTrue(self.lab.received("storebags"))
 
+    def test_a_broken_policy_closes_everything_and_says_where(self):
+        with self.serving("Policy could not be read") as daemon:
+            session = self.client()
+            self.root.write(POLICY, b'{"reporting": "on",\n "host": []}')
+            daemon.wait_for_line(f'Policy could not be read, nothing leaves: {self.root.path}/{POLICY}:2:2: unknown key "host"')
+            wait_until(lambda: session.states(**WHO) == [], "no back ends")
+            self.forget()
+            wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends again")
+
+    def test_a_days_limits_hold_over_a_restart_and_for_all_destinations(self):
+        self.say(dailyEvents=6)  # each message: a post and a datagram; the session's own messages too
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            session = self.client()
+            for number in range(4):
+                session.message(number=number)
+            session.close()
+            wait_until(lambda: self.stats().get("event dropped: the owner's limit for the day is used up"), "a drop")
+        counts = self.counts()
+        left = counts["event posted"] + counts["datagram sent"]
+        self.assertEqual(left, 6)
+        self.assertEqual(json.loads((self.root.path / "var/lib/veltrad/daily.json").read_text())["events"], 6)
+        before = self.arrived()
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=5)
+            self.assertEqual(self.arrived(), before)
+            self.say(dailyEvents=6, dailyBytes=10**6)
+        self.say(dailyBytes=1)
+        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
+            self.client().message(number=6)
+        self.assertEqual(self.arrived(), before)
+
+
+class Withdrawal(PolicyTest):
+    alone = True  # it measures time
+
     def test_a_withdrawal_under_load_stops_the_last_packet_within_a_second(self):
         self.say(consent="always")
         log = self.root.path / "some.log"
@@ -269,34 +304,3 @@ class Policy(PolicyTest):
         for kind in ("events", "dashboard", "logdata", "uploads"):
             last = max(line["time"] for line in self.lab.received(kind))
             self.assertLess(last, withdrawn + 1, kind)
-
-    def test_a_broken_policy_closes_everything_and_says_where(self):
-        with self.serving("Policy could not be read") as daemon:
-            session = self.client()
-            self.root.write(POLICY, b'{"reporting": "on",\n "host": []}')
-            daemon.wait_for_line(f'Policy could not be read, nothing leaves: {self.root.path}/{POLICY}:2:2: unknown key "host"')
-            wait_until(lambda: session.states(**WHO) == [], "no back ends")
-            self.forget()
-            wait_until(lambda: session.states(**WHO) == BACKENDS, "the back ends again")
-
-    def test_a_days_limits_hold_over_a_restart_and_for_all_destinations(self):
-        self.say(dailyEvents=6)  # each message: a post and a datagram; the session's own messages too
-        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
-            session = self.client()
-            for number in range(4):
-                session.message(number=number)
-            session.close()
-            wait_until(lambda: self.stats().get("event dropped: the owner's limit for the day is used up"), "a drop")
-        counts = self.counts()
-        left = counts["event posted"] + counts["datagram sent"]
-        self.assertEqual(left, 6)
-        self.assertEqual(json.loads((self.root.path / "var/lib/veltrad/daily.json").read_text())["events"], 6)
-        before = self.arrived()
-        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
-            self.client().message(number=5)
-            self.assertEqual(self.arrived(), before)
-            self.say(dailyEvents=6, dailyBytes=10**6)
-        self.say(dailyBytes=1)
-        with self.serving("The owner of the device does not let it leave (over_daily_limit)"):
-            self.client().message(number=6)
-        self.assertEqual(self.arrived(), before)
