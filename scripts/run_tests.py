@@ -1,7 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals. The next
-preset is built in the time that the tests of the one before leave free: they wait for timers and peers half of it."""
-import concurrent.futures
+"""Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals."""
 import os
 import re
 import shutil
@@ -25,19 +23,13 @@ def say(text):
     print(f"[{time.strftime('%H:%M:%S')}] {text}", flush=True)
 
 
-def build(preset, meanwhile):
-    """Meanwhile, that is during tests, it takes the cores when nobody else wants them, and prints only what fails."""
+def build(preset):
     say(f"{preset}: building")
-    idle = ["chrt", "--idle", "0"] if meanwhile else []
-    for step in (["cmake", "--preset", preset], ["cmake", "--build", "--preset", preset]):
-        quiet = meanwhile or "--build" not in step
-        done = subprocess.run([*idle, *step], cwd=ROOT, stdout=subprocess.PIPE if quiet else None,
-                              stderr=subprocess.STDOUT if quiet else None, text=True, errors="replace")
-        if done.returncode != 0:
-            print(done.stdout or "", flush=True)
-            return False
-    say(f"{preset}: built")
-    return True
+    configure = subprocess.run(["cmake", "--preset", preset], cwd=ROOT, capture_output=True, text=True)
+    if configure.returncode != 0:
+        print(configure.stdout + configure.stderr)
+        return False
+    return subprocess.run(["cmake", "--build", "--preset", preset], cwd=ROOT).returncode == 0
 
 
 def run(command, environment):
@@ -100,18 +92,13 @@ def main():
     if unknown:
         sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected all, or some of: {' '.join(PRESETS)}")
     passed = failed = 0
-    with concurrent.futures.ThreadPoolExecutor(1) as builder:
-        built = [builder.submit(build, presets[0], False)]
-        for number, preset in enumerate(presets):
-            succeeded = built[number].result()
-            if number + 1 < len(presets):
-                built.append(builder.submit(build, presets[number + 1], True))
-            if succeeded:
-                more_passed, more_failed = test(preset)
-                passed, failed = passed + more_passed, failed + more_failed
-            else:
-                say(f"{preset}: does not build")
-                failed += 1
+    for preset in presets:
+        if build(preset):
+            more_passed, more_failed = test(preset)
+            passed, failed = passed + more_passed, failed + more_failed
+        else:
+            say(f"{preset}: does not build")
+            failed += 1
     print(f"{passed} passed, {failed} failed")
     sys.exit(1 if failed else 0)
 
