@@ -11,7 +11,6 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <utility>
 
 #include "base/property_list.h"
 #include "fakes/fake_file_store.h"
@@ -53,7 +52,7 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
  public:
   platform::DeviceProperty value(std::string_view key) override {
     std::lock_guard lock(_mutex);
-    if (std::exchange(_lacksMemory, false)) throw std::bad_alloc();
+    if (_lacksMemory.exchange(false)) throw std::bad_alloc();
     if (_short) return Failure{platform::FileFailure{platform::FileFailure::Kind::shortage, "no descriptor"}};
     const auto found = _values.find(key);
     return found == _values.end() ? std::nullopt : std::optional(found->second);
@@ -68,8 +67,8 @@ class FakeDeviceProperties final : public platform::DeviceProperties {
 
  private:
   std::mutex _mutex;
-  bool _short = false;
-  bool _lacksMemory = false;
+  std::atomic<bool> _short = false;
+  std::atomic<bool> _lacksMemory = false;
   std::map<std::string, std::string, std::less<>> _values{
       {"ProductVersion", "12"},
       {"BuildVersion", "12A301"},
