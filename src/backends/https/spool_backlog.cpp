@@ -35,10 +35,7 @@ std::optional<SpoolBacklog::Name> SpoolBacklog::next() {
 void SpoolBacklog::wasRead(bool done) {
   const Lock held(_mutex);
   _reads = false;
-  if (done && ++_next == _names.size()) {
-    _names = {};
-    _next = 0;
-  }
+  if (done && ++_next == _names.size()) forget();
   _changed.notifyAll();
 }
 
@@ -51,9 +48,13 @@ std::optional<std::vector<SpoolBacklog::Name>> SpoolBacklog::takeAll(Deadline de
   --_takers;
   if (_state != State::known || _reads) return std::nullopt;
   std::vector<Name> all(_names.begin() + static_cast<std::ptrdiff_t>(_next), _names.end());
-  _names = {};
-  _next = 0;
+  forget();
   return all;
+}
+
+void SpoolBacklog::forget() {
+  std::vector<Name>().swap(_names);  // assigning {} would keep the memory
+  _next = 0;
 }
 
 }  // namespace veltrad::backends

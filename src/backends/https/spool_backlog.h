@@ -35,6 +35,8 @@ class SpoolBacklog {
  private:
   enum class State { unknown, beingListed, known };
 
+  void forget() REQUIRES(_mutex);
+
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   State _state GUARDED_BY(_mutex) = State::unknown;
