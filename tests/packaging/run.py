@@ -244,7 +244,8 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
 
     def test_remove_and_purge(self):
         self.box.run("apt-get remove -q -y " + " ".join(PACKAGES))
-        assert "inactive" in self.box.run("systemctl is-active veltrad.service veltrad.socket", check=False)
+        for unit in ("veltrad.service", "veltrad.socket", "veltra-gateway", "veltra-gateway-drain"):
+            assert self.box.run(f"systemctl is-active {unit}", check=False) == "inactive\n", unit
         assert not (self.box.path / "usr/libexec/veltrad").exists()
         assert (self.box.path / "etc/veltrad/ca.pem").exists(), "removal alone keeps the configuration"
         self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
