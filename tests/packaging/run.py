@@ -219,6 +219,8 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
             exposure = self.box.run(f"systemd-analyze security --no-pager {unit}.service").splitlines()[-1]
             assert float(re.search(r"\d+\.\d+", exposure)[0]) <= 2.0, exposure
             self.box.run(f"systemctl stop {unit}")
+        files = self.box.run("stat -c '%a %U:%G' /var/lib/veltra-drain")
+        assert files == "750 veltra-drain:veltra-drain\n", files
 
     def test_upgrade_over_a_running_daemon(self):
         client = subprocess.Popen(self.box.command("exec veltractl session --client-type 7"), stdin=subprocess.PIPE,
@@ -252,6 +254,10 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
         for step in (install, *steps):
             self.box.run(f"cd /packages\n{step}")
         wait_until(lambda: "(1 row)" in self.box.run(query), "the event in a view")
+        processes = "systemctl show -P MainPID veltra-gateway veltra-gateway-drain"
+        before = self.box.run(processes).split()
+        self.box.run("apt-get install -q -y --reinstall /packages/veltra-gateway_*.deb")
+        assert not {"0", *before} & set(self.box.run(processes).split()), "an upgrade lets the old program run"
 
     def test_remove_and_purge(self):
         self.box.run("apt-get remove -q -y " + " ".join(PACKAGES))
