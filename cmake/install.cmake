@@ -71,7 +71,8 @@ if(VELTRA_GATEWAY)
   install(TARGETS veltra-gateway RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT gateway)
   veltra_install_unit(gateway veltra-gateway.service)
   veltra_install_unit(gateway veltra-gateway-drain.service)
-  install(FILES fleet/nginx.conf fleet/stream.conf fleet/postgresql.conf fleet/schema.sql fleet/README.md
+  install(FILES packaging/veltra-gateway.sysusers DESTINATION lib/sysusers.d RENAME veltra-gateway.conf COMPONENT gateway)
+  install(FILES fleet/nginx.conf fleet/stream.conf fleet/postgresql.conf fleet/schema.sql fleet/column_store.sql fleet/README.md
           DESTINATION ${CMAKE_INSTALL_DATADIR}/veltra-gateway COMPONENT gateway)
 endif()
 install(DIRECTORY python/veltra DESTINATION ${PYTHON_DIRECTORY} COMPONENT python PATTERN __pycache__ EXCLUDE)

@@ -274,7 +274,9 @@ class Fleet:
     def command(self, name):
         servers = [word for port, _, _ in self.facts["streams"].values() for word in ("--server", f"nats://127.0.0.1:{port}")]
         if name == "nginx":
-            return [program("nginx"), "-e", str(self.path / "nginx/error.log"), "-c", str(self.path / "nginx/nginx.conf"), "-g", "daemon off;"]
+            folder = self.path / "nginx"
+            return [program("nginx"), "-e", str(folder / "error.log"), "-c", str(folder / "nginx.conf"),
+                    "-g", f"daemon off; pid {folder}/nginx.pid;"]
         if name in STREAMS:
             return [program("nats-server"), "-c", str(self.path / name / "stream.conf")]
         if name in GATEWAYS:
