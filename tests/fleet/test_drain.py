@@ -88,6 +88,32 @@ class Drain(FleetTest):
         self.end("drain")
         self.fleet.start(["drain"])
 
+    def test_a_database_that_hangs_is_left(self):
+        self.end("drain")
+        self.fleet.facts["options"]["drain"] = ["--statement-timeout", "2"]
+        self.addCleanup(self.fleet.facts["options"].pop, "drain")
+        self.fleet.start(["drain"])
+        own = "SELECT pid FROM pg_stat_activity WHERE application_name = 'veltra-gateway drain'"
+        side.wait_until(lambda: self.metric("veltra_drain_events_total") >= 0 and self.fleet.query(own), "its session")
+        for client in ("hangs", "waits for a lock"):
+            with self.subTest(client=client):
+                before = self.metric("veltra_drain_restarts_total")
+                if client == "hangs":
+                    backend = int(self.fleet.query(own)[0][0])
+                    os.kill(backend, signal.SIGSTOP)
+                    self.addCleanup(lambda: pathlib.Path(f"/proc/{backend}").exists() and os.kill(backend, signal.SIGCONT))
+                else:
+                    session = self.holds("LOCK TABLE veltra.position", "veltra.position")
+                self.assertEqual(self.direct().post("/events", envelope({}, client=client)).status, 200)
+                side.wait_until(lambda: self.metric("veltra_drain_restarts_total") > before, "it gives the statement up", 20)
+                side.wait_until(lambda: self.metric("veltra_drain_lag_messages") >= 1, "what waits is known")
+                if client == "hangs":
+                    os.kill(backend, signal.SIGCONT)
+                else:
+                    session.kill()
+                    self.fleet.query("SELECT pg_terminate_backend(pid) FROM pg_locks WHERE relation = 'veltra.position'::regclass")
+                self.assertEqual(len(self.rows(f"SELECT 1 FROM veltra.events WHERE client_id = '{client}'", 1)), 1)
+
     def test_it_ends_in_time_also_if_the_database_does_not_answer(self):
         session = self.holds("LOCK TABLE veltra.position", "veltra.position")
         self.assertEqual(self.direct().post("/events", envelope({}, client="locked")).status, 200)

@@ -132,7 +132,8 @@ void Drain::measure(StreamReader& reader) {
 }
 
 std::string Drain::runOnce() {
-  auto database = Database::open(_given.database);
+  auto database = Database::open(
+      _given.database, std::chrono::milliseconds(static_cast<std::int64_t>(_given.statement * 1'000)));
   if (!database) return database.error().detail;
   auto active = TableWriter::becomeActive(*database.value(), _stream.name);
   if (!active) return active.error().detail;

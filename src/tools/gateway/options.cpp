@@ -121,6 +121,11 @@ void describeDrain(CLI::App& app, Arguments& given) {
       ->type_name("N")
       ->check(CLI::Range(1, 10'000))
       ->capture_default_str();
+  app.add_option("--statement-timeout", drain.statement,
+                 "Seconds that a statement of the database may take; housekeeping has half an hour")
+      ->type_name("SECONDS")
+      ->check(CLI::Range(0.1, 1'800.0))
+      ->capture_default_str();
   app.add_option(
          "--purge-after", drain.purgeAfter,
          "Seconds after which the stream forgets what the tables hold. Servers that start anew learn the IDs "
