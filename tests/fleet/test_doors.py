@@ -181,12 +181,17 @@ class Alone(unittest.TestCase):
                 link.connect(str(path))
                 link.sendall(b"GET /events HTTP/1.1\r\nHost: h\r\n\r\n")
                 self.assertTrue(link.recv(1000).startswith(b"HTTP/1.1 405"))
+            second = [side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--admin", "127.0.0.1:0", "--listen", f"unix:{path}"]
+            refused = subprocess.run(second, capture_output=True, text=True)
+            self.assertEqual(refused.returncode, 1)
+            self.assertIn(f"process {process.pid} holds", refused.stderr)
+            with socket.socket(socket.AF_UNIX) as link:
+                link.connect(str(path))
             process.terminate()
             self.assertEqual(process.wait(15), 0)
             self.assertFalse(path.exists())
             path.write_text("not a socket")
-            refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
-                                     capture_output=True, text=True)
+            refused = subprocess.run(second, capture_output=True, text=True)
             self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
 
     def test_connections_between_requests_keep_little(self):
