@@ -1,5 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
 """What gateways take and refuse, and that it is in the tables as it came."""
+import contextlib
 import gzip
 import hashlib
 import json
@@ -234,16 +235,28 @@ class Alone(unittest.TestCase):
             self.assertEqual(process.wait(15), 0)
 
     def test_beyond_the_bounds_it_says_so_at_once(self):
-        _, door, line = self.gateway("--hold-messages", "1", hold="5")
-        host, port = door.address
-        with socket.create_connection((host, port)) as waiting:
-            body = envelope({})
-            waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
-            admin = line["admin"] + "/metrics"
-            side.wait_until(lambda: b"veltra_gateway_held 1" in urllib.request.urlopen(admin).read(), "the first is held")
+        _, door, line = self.gateway("--hold-messages", "128", "--dashboard", "127.0.0.1:0", hold="5")
+        dashboard, admin = Dashboard(line["dashboard"]), line["admin"] + "/metrics"
+        for number in range(100):
+            dashboard.socket.send(datagram(number))
+        side.wait_until(lambda: b'datagrams_total{result="no_room"} 36' in urllib.request.urlopen(admin).read(), "half of them is held")
+        with contextlib.ExitStack() as stack:
+            for number in range(64):
+                waiting = stack.enter_context(socket.create_connection(door.address))
+                body = envelope({"n": number})
+                waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            side.wait_until(lambda: b"veltra_gateway_held 128" in urllib.request.urlopen(admin).read(), "all of them are held")
             begin = time.monotonic()
-            self.assertEqual(door.post("/events", envelope({"second": 1})).status, 429)
+            answer = door.post("/events", envelope({"last": 1}))
+            self.assertEqual((answer.status, answer.headers["X-VLT-Refused"]), (429, "no_room"))
             self.assertLess(time.monotonic() - begin, 2)
+
+    def test_the_least_room_has_the_largest_body(self):
+        _, door, _ = self.gateway("--hold-bytes", str(96 << 20), "--hold-messages", "128", hold="2")
+        for path, body, headers in (("/events", envelope({"t": "x" * ((16 << 20) - 1000)}), JSON),
+                                    ("/logdata", plistlib.dumps(["x" * ((32 << 20) - 1000)], fmt=plistlib.FMT_BINARY), {})):
+            answer = door.request("POST", path, body, headers)
+            self.assertEqual((answer.status, answer.headers["X-VLT-Refused"]), (429, "held_too_long"), path)
 
     def test_what_has_begun_is_answered_at_the_end(self):
         process, door, line = self.gateway(hold="2")

@@ -126,7 +126,7 @@ int serve(const Arguments& given) {
                     {.connections = given.serve.connections});
   const auto listen = server.listen(given.serve.listen);
   if (!listen) return failed("--listen " + listen.error());
-  DatagramDoor datagrams(*publisher, metrics);
+  DatagramDoor datagrams(*publisher, metrics, given.serve.holdMessages / 2);
   Dictionary line{{"listen", asURL(listen.value())}, {"pid", static_cast<long>(::getpid())}};
   if (!given.serve.dashboard.empty()) {
     const auto bound = datagrams.start(given.serve.dashboard);
