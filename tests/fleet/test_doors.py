@@ -8,6 +8,7 @@ import os
 import pathlib
 import plistlib
 import re
+import select
 import signal
 import socket
 import subprocess
@@ -257,6 +258,20 @@ class Alone(unittest.TestCase):
                                     ("/logdata", plistlib.dumps(["x" * ((32 << 20) - 1000)], fmt=plistlib.FMT_BINARY), {})):
             answer = door.request("POST", path, body, headers)
             self.assertEqual((answer.status, answer.headers["X-VLT-Refused"]), (429, "held_too_long"), path)
+
+    def test_others_are_answered_while_a_large_body_is_checked(self):
+        _, door, _ = self.gateway()
+        body = packed(plistlib.dumps(["x" * 60] * 490_000, fmt=plistlib.FMT_BINARY))  # a text of which the list has many
+        with socket.create_connection(door.address) as large:
+            begin, longest = time.monotonic(), 0
+            large.sendall(b"POST /logdata HTTP/1.1\r\nHost: h\r\nContent-Encoding: gzip\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            while not select.select([large], [], [], 0.01)[0]:
+                asked = time.monotonic()
+                self.assertEqual(door.request("GET", "/events").status, 405)
+                longest = max(longest, time.monotonic() - asked)
+            self.assertIn(b"held_too_long", large.recv(1000))
+        # Without the time for which it is held.
+        self.assertLess(longest, (time.monotonic() - begin - 0.5) / 3)
 
     def test_what_has_begun_is_answered_at_the_end(self):
         process, door, line = self.gateway(hold="2")

@@ -20,6 +20,10 @@ namespace {
 constexpr PropertyListLimits kLogDataLimits{32u << 20, 64, 500'000, 32u << 20};
 constexpr std::size_t kLocationDigits = 32;
 
+// A larger envelope is checked aside: one of this size takes some milliseconds. Log data always are, because
+// a short list can hold the same long text many times.
+constexpr std::size_t kLongTurnBytes = 64u << 10;
+
 using Answering = std::function<void(Answer)>;
 
 // The message's ID and, where the device has sent one, the post's.
@@ -66,6 +70,12 @@ class EventsTaker final : public BodyTaker {
 
   void finish(Answering answering) override {
     if (auto refusal = _body.end()) return answering(std::move(*refusal));
+    if (_body.text().size() <= kLongTurnBytes) return check(std::move(answering));
+    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  }
+
+ private:
+  void check(Answering answering) {
     const auto envelope = parseEnvelope(_body.text());
     if (!envelope) return answering(_services.refusals.malformed("events", envelope.error(), _body.text()));
     const std::uint64_t count = envelope.value().events.size();
@@ -78,7 +88,6 @@ class EventsTaker final : public BodyTaker {
                  answeringWith(_services, Answer{}, _services.metrics.posts, count, std::move(answering)));
   }
 
- private:
   const DoorServices& _services;
   const Wanted _wanted;
   ReceivedBody _body;
@@ -96,6 +105,11 @@ class LogDataTaker final : public BodyTaker {
 
   void finish(Answering answering) override {
     if (auto refusal = _body.end()) return answering(std::move(*refusal));
+    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  }
+
+ private:
+  void check(Answering answering) {
     auto text = json();
     if (!text) return answering(std::move(text.error()));
     std::string digest = digestOf(_wanted.path, _body.text());
@@ -108,7 +122,6 @@ class LogDataTaker final : public BodyTaker {
                                0, std::move(answering)));
   }
 
- private:
   // As JSON a list can be many times as long, so more than the bound is never written.
   Result<std::string, Answer> json() {
     const auto list = formats::parsePropertyList(_body.text(), kLogDataLimits);

@@ -38,7 +38,8 @@ struct Answer {
   std::vector<std::pair<std::string, std::string>> headers;
 };
 
-// Takes the body of one request. Used on the server's thread, which destroys it.
+// Takes the body of one request. Used on the server's thread, which destroys it, and not before the answer
+// that it owes.
 class BodyTaker {
  public:
   virtual ~BodyTaker() = default;

@@ -14,6 +14,7 @@
 #include "gateway/admin.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
+#include "gateway/work_queue.h"
 #include "platform/service_manager.h"
 
 namespace veltrad::gateway {
@@ -121,7 +122,10 @@ int serve(const Arguments& given) {
   if (!opened) return failed(opened.error());
   // Destroyed first, so that no completion comes after what it uses.
   std::unique_ptr<Publisher> publisher = std::move(opened).value();
-  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed);
+  WorkQueue bodies;
+  if (!bodies.start()) return failed("a thread cannot be started");
+  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
+            [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
   HTTPServer server([&door](const RequestHead& head) { return door.request(head); },
                     {.connections = given.serve.connections});
   const auto listen = server.listen(given.serve.listen);
@@ -153,6 +157,7 @@ int serve(const Arguments& given) {
   admin.reset();
   server.end();
   serving.join();
+  bodies.end();
   publisher.reset();
   return 0;
 }
