@@ -144,6 +144,28 @@ class Doors(FleetTest):
         self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
         self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
 
+    def test_each_user_of_the_stream_may_do_what_it_needs_alone(self):
+        def put(subject, body=b""):
+            return b"PUB %s %d\r\n%s\r\n" % (subject, len(body), body)
+        rows = [  # user, what it says, and whether the server lets it
+            ("gateway", put(b"veltra.refused", b"x"), True),
+            ("gateway", put(b"$JS.API.STREAM.PURGE.VELTRA"), False),
+            ("gateway", put(b"$JS.API.STREAM.DELETE.VELTRA"), False),
+            ("gateway", put(b"$JS.API.STREAM.MSG.GET.VELTRA", b'{"seq":1}'), False),
+            ("gateway", b"SUB veltra.> 1\r\n", False),
+            ("gateway", b"SUB _INBOX.veltra-drain.> 1\r\n", False),
+            ("drain", put(b"veltra.events", b"x"), False),
+            ("drain", put(b"$JS.API.STREAM.DELETE.VELTRA"), False),
+            ("drain", put(b"$JS.API.STREAM.INFO.VELTRA"), True),
+            (None, put(b"veltra.events", b"x"), False),
+        ]
+        for user, line, allowed in rows:
+            with self.subTest(user=user, line=line):
+                faults = [said for said in self.say(user, line) if said.startswith("-ERR")]
+                self.assertEqual(faults == [], allowed, faults)
+        for name in ("secrets", "files", *side.STREAMS):
+            self.assertEqual((self.fleet.path / name).stat().st_mode & 0o077, 0, name)
+
     def test_storebags_go_back(self):
         door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
         self.fleet.publish("ostvane", bags[0])

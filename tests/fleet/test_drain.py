@@ -4,7 +4,6 @@ import os
 import pathlib
 import re
 import signal
-import socket
 import subprocess
 import time
 import urllib.request
@@ -18,17 +17,9 @@ class Drain(FleetTest):
         text = urllib.request.urlopen(self.line["drain"] + "/metrics", timeout=5).read().decode()
         return float(re.search(rf"^{name} (\S+)$", text, re.M)[1])
 
-    def talk(self, *lines):
-        """Says something to a server of the stream in its own protocol, and waits until it has been read."""
-        with socket.create_connection(("127.0.0.1", self.fleet.facts["streams"]["stream1"][0]), 10) as link:
-            link.sendall(b'CONNECT {"verbose":false,"headers":true}\r\n' + b"".join(lines) + b"PING\r\n")
-            answer = link.makefile("rb")
-            while answer.readline().strip() != b"PONG":
-                pass
-
     def put(self, subject, body, **headers):
         head = "NATS/1.0\r\n" + "".join(f"{name.replace('_', '-')}: {text}\r\n" for name, text in headers.items()) + "\r\n"
-        self.talk(f"HPUB veltra.{subject} {len(head)} {len(head) + len(body)}\r\n{head}".encode() + body + b"\r\n")
+        self.say("admin", f"HPUB veltra.{subject} {len(head)} {len(head) + len(body)}\r\n{head}".encode() + body + b"\r\n")
 
     def end(self, name, number=signal.SIGKILL):
         pid = self.fleet.facts["pids"][name]
@@ -138,6 +129,6 @@ class Drain(FleetTest):
         self.assertEqual(self.metric("veltra_drain_restarts_total"), 0)
 
     def test_a_stream_that_was_made_anew_is_read_from_its_start(self):
-        self.talk(b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
+        self.say("admin", b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
         side.wait_until(lambda: self.direct().post("/events", envelope({}, client="anew")).status == 200, "a new stream")
         self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'anew'", 1)

@@ -270,7 +270,9 @@ void Drain::keepHouse(StreamReader& reader, TableWriter& writer, std::int64_t re
 
 int drain(const Arguments& given) {
   blockStopSignals();
-  Drain carrying(streamOptions(given.stream), given.drain);
+  StreamOptions stream = streamOptions(given.stream);
+  stream.inbox = "_INBOX.veltra-drain";
+  Drain carrying(std::move(stream), given.drain);
   const DrainCounts& counts = carrying.counts();
   Admin admin({[&counts] { return counts.active ? "" : "it does not read the stream"; },
                [&counts] { return counts.text(); }});

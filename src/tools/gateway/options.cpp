@@ -60,7 +60,9 @@ void describeStream(CLI::App& app, StreamArguments& given) {
       ->type_name("TEXT")
       ->check(&faultOfPrefix)
       ->capture_default_str();
-  app.add_option("--credentials", given.credentials, "File with the credentials of the stream's user")
+  app.add_option("--credentials", given.credentials,
+                 "File with the credentials of the stream's user: a line NAME:PASSWORD, or what the servers' "
+                 "tools write")
       ->type_name("FILE");
   app.add_option("--ca", given.ca, "File with the certificates that sign those of the stream's servers")
       ->type_name("FILE");

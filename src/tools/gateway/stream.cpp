@@ -11,6 +11,7 @@
 
 #include "formats/json.h"
 #include "platform/log.h"
+#include "platform/uuid.h"
 
 namespace veltrad::gateway {
 
@@ -69,14 +70,10 @@ Result<std::unique_ptr<Stream>, std::string> Stream::open(StreamOptions options,
   auto connection = NATSConnection::open(self->_options, self->_listener.back);
   if (!connection) return Failure{std::move(connection.error())};
   self->_connection = std::move(connection).value();
-  natsInbox* inbox = nullptr;
-  natsStatus status = natsInbox_Create(&inbox);
-  if (status == NATS_OK) {
-    self->_inbox = std::string(inbox) + ".";
-    natsInbox_Destroy(inbox);
-    status = natsConnection_Subscribe(&self->_answers, self->_connection->get(), (self->_inbox + "*").c_str(),
-                                      &StreamCallbacks::answered, self.get());
-  }
+  self->_inbox = self->_options.inbox + "." + platform::randomUUIDText() + ".";
+  natsStatus status =
+      natsConnection_Subscribe(&self->_answers, self->_connection->get(), (self->_inbox + "*").c_str(),
+                               &StreamCallbacks::answered, self.get());
   if (status == NATS_OK)
     status = natsSubscription_SetOnCompleteCB(self->_answers, &StreamCallbacks::unsubscribed, self.get());
   if (status == NATS_OK) status = natsSubscription_SetPendingLimits(self->_answers, kMostAnswersWaiting, -1);
