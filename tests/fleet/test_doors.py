@@ -191,6 +191,22 @@ class Doors(FleetTest):
             self.assertEqual((missing.status, missing.body), (404, b""), path)
 
 
+class Rates(FleetTest):
+    """Too much from one sender."""
+    parts = ["nginx"]
+    options = {"rate": "1r/s"}
+
+    def test_is_refused_without_a_body_and_is_to_come_again(self):
+        self.fleet.publish("quindle", json.dumps({"version": "1", "release": {}}))
+        door = self.through()
+        answers = [door.request("GET", "/bags/maple/quindle") for _ in range(230)]
+        refused = [answer for answer in answers if answer.status != 200]
+        self.assertTrue(answers[200].status == 200 and 10 < len(refused) < 30, refused)
+        self.assertEqual({(answer.status, answer.body, answer.headers["Retry-After"]) for answer in refused}, {(429, b"", "10")})
+        answer = door.post("/events", envelope({}))
+        self.assertEqual((answer.status, answer.body), (429, b""))
+
+
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
 
