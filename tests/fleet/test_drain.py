@@ -128,6 +128,25 @@ class Drain(FleetTest):
         self.assertLess(int(re.search(r"^VmHWM:\s+(\d+)", status, re.M)[1]), 128 << 10)
         self.assertEqual(self.metric("veltra_drain_restarts_total"), 0)
 
+    def test_users_that_were_refused_for_a_while_come_back(self):
+        def replace(old, new):
+            for name in side.STREAMS:
+                configuration = self.fleet.path / name / "stream.conf"
+                configuration.write_text(configuration.read_text().replace(old, new))
+                self.fleet.kill(name, signal.SIGHUP)
+        passwords = [self.fleet.secret(user).read_text().strip().split(":")[1] for user in ("gateway", "drain")]
+        before = self.metric("veltra_drain_restarts_total")
+        for password in passwords:
+            replace(password, "not " + password)
+        logs = [self.fleet.path / f"logs/{name}.log" for name in side.GATEWAYS]
+        side.wait_until(lambda: all("refuse this connection for good" in log.read_text() for log in logs), "the gateways' end")
+        side.wait_until(lambda: self.metric("veltra_drain_restarts_total") > before + 2, "the drain's end")
+        for password in passwords:
+            replace("not " + password, password)
+        for gateway in (0, 1):
+            side.wait_until(lambda: self.direct(gateway).post("/events", envelope({"n": gateway}, client="refused")).status == 200, "an answer")
+        self.rows("SELECT DISTINCT fields FROM veltra.events WHERE client_id = 'refused'", 2)
+
     def test_a_stream_that_was_made_anew_is_read_from_its_start(self):
         self.say("admin", b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
         side.wait_until(lambda: self.direct().post("/events", envelope({}, client="anew")).status == 200, "a new stream")

@@ -114,7 +114,7 @@ void Drain::run() {
     if (why.empty()) continue;
     ++_counts.restarts;
     if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
-    if (!looking) {
+    if (!looking || looking->isOver()) {
       if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
     }
     if (looking) measure(*looking);
@@ -154,8 +154,8 @@ std::string Drain::runOnce() {
 
 std::string Drain::carry(StreamReader& reader, TableWriter& writer) {
   auto state = reader.state();
-  while (!state && pause(kBetweenTries)) state = reader.state();
-  if (!state) return "";
+  while (!state && !reader.isOver() && pause(kBetweenTries)) state = reader.state();
+  if (!state) return stopping() ? "" : state.error();
   const auto place = findPlace(reader, writer, state.value());
   if (!place) return place.error();
   if (stopping()) return "";

@@ -121,6 +121,10 @@ NATSConnection::~NATSConnection() {
   natsConnection_Destroy(_connection);
 }
 
+bool NATSConnection::isOver() const {
+  return natsConnection_IsClosed(_connection);
+}
+
 bool NATSConnection::connected() const {
   return natsConnection_Status(_connection) == NATS_CONN_STATUS_CONNECTED;
 }

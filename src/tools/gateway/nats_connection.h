@@ -43,6 +43,9 @@ class NATSConnection {
   ~NATSConnection();
 
   bool connected() const;
+  // It will not be connected again, as after two refusals of the user's password in a row: only another one
+  // can be.
+  bool isOver() const;
   __natsConnection* get() const { return _connection; }
   __jsCtx* jetStream() const { return _jetStream; }
 
