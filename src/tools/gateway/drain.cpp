@@ -165,7 +165,9 @@ std::string Drain::carry(StreamReader& reader, TableWriter& writer) {
   _purges = PurgePlan(std::chrono::duration<double>(_given.purgeAfter));
   if (_reached > 0) _purges.reached(_reached, std::chrono::steady_clock::now());
   if (auto begun = reader.startBehind(_reached); !begun) return begun.error();
-  logInfo("drain: reads %s behind %llu", _stream.name.c_str(), static_cast<unsigned long long>(_reached));
+  if (const auto line =
+          _begins.happened("drain: reads " + _stream.name + " behind " + std::to_string(_reached)))
+    logInfo("%s", line->c_str());
   _counts.active = true;
   std::int64_t read = 0;
   while (!stopping()) {
