@@ -99,6 +99,7 @@ void Database::begin() {
 
 Result<Done, StoreError> Database::await(short events) {
   const int socket = PQsocket(_connection.get());
+  if (socket < 0) return Failure{lost()};
   for (;;) {
     const auto left =
         std::chrono::ceil<std::chrono::milliseconds>(_deadline - std::chrono::steady_clock::now());
