@@ -27,8 +27,8 @@ constexpr std::size_t kLongTurnBytes = 64u << 10;
 using Answering = std::function<void(Answer)>;
 
 // The message's ID and, where the device has sent one, the post's.
-void identify(Message& message, const Wanted& wanted, std::string digest) {
-  message.id = wanted.postID.empty() ? std::move(digest) : wanted.postID;
+void identify(Message& message, const Wanted& wanted, const std::string& digest) {
+  message.id = wanted.postID.empty() ? digest : wanted.postID;
   if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
 }
 
@@ -112,10 +112,10 @@ class LogDataTaker final : public BodyTaker {
   void check(Answering answering) {
     auto text = json();
     if (!text) return answering(std::move(text.error()));
-    std::string digest = digestOf(_wanted.path, _body.text());
+    const std::string digest = digestOf(_wanted.path, _body.text());
     const std::string location = "/logdata/" + digest.substr(0, kLocationDigits);
     Message message{subject::kLogData, "", {{header::kLocation, location}}, std::move(text).value()};
-    identify(message, _wanted, std::move(digest));
+    identify(message, _wanted, digest);
     if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
     publishWhole(_services.publisher, std::move(message),
                  answeringWith(_services, Answer{200, location, "text/plain", {}}, _services.metrics.logData,
@@ -154,7 +154,7 @@ class FileTaker final : public BodyTaker {
         _pieces(services.publisher) {
     _message.add(_wanted.path);
     // A content that begins like the end of another path is another file.
-    _message.add(std::string_view("", 1));
+    _message.add(std::string_view("\0", 1));
   }
 
   std::optional<Answer> take(std::string_view& bytes) override {

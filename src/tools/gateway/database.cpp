@@ -162,6 +162,7 @@ Result<Database::Column, StoreError> Database::run(const std::string& statements
 Result<Database::Column, StoreError> Database::run(const std::string& statement,
                                                    const std::vector<std::string>& parameters) {
   std::vector<const char*> texts;
+  texts.reserve(parameters.size());
   for (const std::string& parameter : parameters) texts.push_back(parameter.c_str());
   begin();
   return columnOf(PQsendQueryParams(_connection.get(), statement.c_str(), static_cast<int>(texts.size()),

@@ -219,7 +219,7 @@ Result<std::uint64_t, std::string> Drain::findPlace(StreamReader& reader, TableW
                  static_cast<unsigned long long>(state.firstSeq), static_cast<unsigned long long>(seq));
     return seq;
   }
-  const auto common = placeUpTo(reader, state, seq, time);
+  auto common = placeUpTo(reader, state, seq, time);
   if (!common) return common;
   logWarning("drain: the stream has lost its messages from %llu to %llu, which the tables have",
              static_cast<unsigned long long>(common.value() + 1), static_cast<unsigned long long>(seq));

@@ -76,7 +76,7 @@ Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const Taken* b
     return written;
   }
   const Taken* middle = begin + (end - begin) / 2;
-  const auto first = writeHalves(begin, middle);
+  auto first = writeHalves(begin, middle);
   if (!first) return first;
   written = writeHalves(middle, end);
   if (!written) return written;
