@@ -38,7 +38,9 @@ CREATE TABLE IF NOT EXISTS veltra.events (
   happened timestamptz,
   fields jsonb NOT NULL
 ) PARTITION BY RANGE (received);
-CREATE INDEX IF NOT EXISTS events_received ON veltra.events USING brin (received);
+-- A condition on a view's hour or day finds here which parts of which days it needs.
+CREATE INDEX IF NOT EXISTS events_received ON veltra.events USING brin (received,
+  date_bin('1 hour', received, '2000-01-01 00:00+00'), date_bin('1 day', received, '2000-01-01 00:00+00')) WITH (autosummarize = on);
 CREATE INDEX IF NOT EXISTS events_client ON veltra.events (client_id, received);
 CREATE INDEX IF NOT EXISTS events_session ON veltra.events (session_id);
 
@@ -127,12 +129,12 @@ BEGIN
   END LOOP;
 END $$;
 
--- The views. Hours and days are those of UTC, whatever time zone a session of the database has. A condition on them reads all
--- that is kept: for a part of it, ask the tables with a condition on "received". A null stands for what an event does not say.
+-- The views. Hours and days are those of UTC, whatever time zone a session of the database has. A condition on "hour" or "day"
+-- reads those alone, and of other days their last megabyte and what autovacuum has not yet seen. A null stands for what an event does not say.
 
 -- Events of each client type and hour. Sessions and clients of an hour count once in it.
 CREATE OR REPLACE VIEW veltra.events_by_hour AS
-SELECT date_trunc('hour', received, 'UTC') AS hour, sender, count(*) AS events,
+SELECT date_bin('1 hour', received, '2000-01-01 00:00+00') AS hour, sender, count(*) AS events,
        count(DISTINCT client_id || '/' || session_id) AS sessions, count(DISTINCT client_id) AS clients
 FROM veltra.events
 GROUP BY 1, 2;
@@ -157,7 +159,7 @@ GROUP BY client_id, session_id, session_path;
 -- "expected" is how many there were for those that reported. It is null if some stop message does not say its threshold, or says
 -- 0, with which only messages that override sampling report; "share" is then that of the others.
 CREATE OR REPLACE VIEW veltra.sampled AS
-SELECT date_trunc('day', received, 'UTC') AS day, sender, via,
+SELECT date_bin('1 day', received, '2000-01-01 00:00+00') AS day, sender, via,
        count(*) AS sessions,
        round(count(stands_for) / sum(stands_for), 4) AS share,
        CASE WHEN count(stands_for) = count(*) THEN round(sum(stands_for), 1) END AS expected
@@ -210,7 +212,7 @@ SELECT * FROM counted WHERE missing > 0;
 -- writes a label with a version into the "post_url" of each ("https://…/events/main-v42"), which is "via". "library" is the version
 -- of the client library. A client that changes within an hour counts with both versions.
 CREATE OR REPLACE VIEW veltra.storebag_versions AS
-SELECT date_trunc('hour', received, 'UTC') AS hour, via, fields->>'_reportVers' AS library, sender,
+SELECT date_bin('1 hour', received, '2000-01-01 00:00+00') AS hour, via, fields->>'_reportVers' AS library, sender,
        count(DISTINCT client_id) AS clients, count(DISTINCT client_id || '/' || session_id) AS sessions, count(*) AS events
 FROM veltra.events
 GROUP BY 1, 2, 3, 4;

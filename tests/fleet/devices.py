@@ -110,6 +110,19 @@ class FleetTest(unittest.TestCase):
     def prepare(cls):
         """Before the parts start."""
 
+    def say(self, user, *lines, server="stream1"):
+        """Says something to a server of the stream in its own protocol; what it says until it has read that."""
+        name, password = self.fleet.secret(user).read_text().strip().split(":") if user else ("", "")
+        words = {"verbose": False, "headers": True, **({"user": name, "pass": password} if user else {})}
+        with socket.create_connection(("127.0.0.1", self.fleet.facts["streams"][server][0]), 10) as link:
+            link.sendall(b"CONNECT " + json.dumps(words).encode() + b"\r\n" + b"".join(lines) + b"PING\r\n")
+            heard = []
+            for line in link.makefile("rb"):
+                heard.append(line.strip().decode())
+                if heard[-1] == "PONG":
+                    break
+            return heard
+
     def direct(self, at=0):
         port = int(self.line["gateways"][at]["listen"].rsplit(":", 1)[1])
         return self.closing(Door(("127.0.0.1", port)))

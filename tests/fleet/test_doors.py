@@ -1,12 +1,15 @@
 # SPDX-License-Identifier: Apache-2.0
 """What gateways take and refuse, and that it is in the tables as it came."""
+import contextlib
 import gzip
 import hashlib
+import http.client
 import json
 import os
 import pathlib
 import plistlib
 import re
+import select
 import signal
 import socket
 import subprocess
@@ -142,6 +145,28 @@ class Doors(FleetTest):
         self.assertTrue(dashboard.ask(datagram(4, b" $date=5", session=78)))
         self.assertEqual(self.rows("SELECT fields FROM veltra.datagrams WHERE session_id = 78", 1), [['{"$date": "5"}']])
 
+    def test_each_user_of_the_stream_may_do_what_it_needs_alone(self):
+        def put(subject, body=b""):
+            return b"PUB %s %d\r\n%s\r\n" % (subject, len(body), body)
+        rows = [  # user, what it says, and whether the server lets it
+            ("gateway", put(b"veltra.refused", b"x"), True),
+            ("gateway", put(b"$JS.API.STREAM.PURGE.VELTRA"), False),
+            ("gateway", put(b"$JS.API.STREAM.DELETE.VELTRA"), False),
+            ("gateway", put(b"$JS.API.STREAM.MSG.GET.VELTRA", b'{"seq":1}'), False),
+            ("gateway", b"SUB veltra.> 1\r\n", False),
+            ("gateway", b"SUB _INBOX.veltra-drain.> 1\r\n", False),
+            ("drain", put(b"veltra.events", b"x"), False),
+            ("drain", put(b"$JS.API.STREAM.DELETE.VELTRA"), False),
+            ("drain", put(b"$JS.API.STREAM.INFO.VELTRA"), True),
+            (None, put(b"veltra.events", b"x"), False),
+        ]
+        for user, line, allowed in rows:
+            with self.subTest(user=user, line=line):
+                faults = [said for said in self.say(user, line) if said.startswith("-ERR")]
+                self.assertEqual(faults == [], allowed, faults)
+        for name in ("secrets", "files", *side.STREAMS):
+            self.assertEqual((self.fleet.path / name).stat().st_mode & 0o077, 0, name)
+
     def test_storebags_go_back(self):
         door, bags = self.through(), [json.dumps({"version": version, "release": {}}) for version in ("1", "2")]
         self.fleet.publish("ostvane", bags[0])
@@ -166,6 +191,23 @@ class Doors(FleetTest):
             missing = door.request("GET", "/bags/maple/" + path)
             self.assertEqual((missing.status, missing.body), (404, b""), path)
 
+    def test_too_much_from_one_sender_is_to_come_again(self):
+        def limit(old, new):
+            configuration = self.fleet.path / "nginx/nginx.conf"
+            configuration.write_text(configuration.read_text().replace(f"rate={old}", f"rate={new}"))
+            self.fleet.kill("nginx", signal.SIGHUP)
+        self.addCleanup(limit, "1r/s", "100000r/s")
+        limit("100000r/s", "1r/s")
+        door, answers = self.through(), []
+
+        def refused():
+            with contextlib.suppress(OSError, http.client.HTTPException):  # the process before closes its connections
+                answers.append(door.post("/events", b"{"))
+            return answers[-1].status == 429 and answers[-1]
+        answer = side.wait_until(refused, "a refusal")
+        self.assertGreater(len(answers), 200, "which may come at once")
+        self.assertEqual((answer.body, answer.headers["Retry-After"], answer.headers["X-VLT-Refused"]), (b"", "10", None))
+
 
 class Alone(unittest.TestCase):
     """A gateway whose stream cannot be reached."""
@@ -181,12 +223,17 @@ class Alone(unittest.TestCase):
                 link.connect(str(path))
                 link.sendall(b"GET /events HTTP/1.1\r\nHost: h\r\n\r\n")
                 self.assertTrue(link.recv(1000).startswith(b"HTTP/1.1 405"))
+            second = [side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--admin", "127.0.0.1:0", "--listen", f"unix:{path}"]
+            refused = subprocess.run(second, capture_output=True, text=True, timeout=20)
+            self.assertEqual(refused.returncode, 1)
+            self.assertIn(f"process {process.pid} holds", refused.stderr)
+            with socket.socket(socket.AF_UNIX) as link:
+                link.connect(str(path))
             process.terminate()
             self.assertEqual(process.wait(15), 0)
             self.assertFalse(path.exists())
             path.write_text("not a socket")
-            refused = subprocess.run([side.program("veltra-gateway"), "--server", "nats://127.0.0.1:1", "--listen", f"unix:{path}"],
-                                     capture_output=True, text=True)
+            refused = subprocess.run(second, capture_output=True, text=True)
             self.assertEqual((refused.returncode, path.read_text()), (1, "not a socket"), refused.stderr)
 
     def test_connections_between_requests_keep_little(self):
@@ -229,16 +276,42 @@ class Alone(unittest.TestCase):
             self.assertEqual(process.wait(15), 0)
 
     def test_beyond_the_bounds_it_says_so_at_once(self):
-        _, door, line = self.gateway("--hold-messages", "1", hold="5")
-        host, port = door.address
-        with socket.create_connection((host, port)) as waiting:
-            body = envelope({})
-            waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
-            admin = line["admin"] + "/metrics"
-            side.wait_until(lambda: b"veltra_gateway_held 1" in urllib.request.urlopen(admin).read(), "the first is held")
+        _, door, line = self.gateway("--hold-messages", "128", "--dashboard", "127.0.0.1:0", hold="5")
+        dashboard, admin = Dashboard(line["dashboard"]), line["admin"] + "/metrics"
+        for number in range(100):
+            dashboard.socket.send(datagram(number))
+        side.wait_until(lambda: b'datagrams_total{result="no_room"} 36' in urllib.request.urlopen(admin).read(), "half of them is held")
+        with contextlib.ExitStack() as stack:
+            for number in range(64):
+                waiting = stack.enter_context(socket.create_connection(door.address))
+                body = envelope({"n": number})
+                waiting.sendall(b"POST /events HTTP/1.1\r\nHost: h\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            side.wait_until(lambda: b"veltra_gateway_held 128" in urllib.request.urlopen(admin).read(), "all of them are held")
             begin = time.monotonic()
-            self.assertEqual(door.post("/events", envelope({"second": 1})).status, 429)
+            answer = door.post("/events", envelope({"last": 1}))
+            self.assertEqual((answer.status, answer.headers["X-VLT-Refused"]), (429, "no_room"))
             self.assertLess(time.monotonic() - begin, 2)
+
+    def test_the_least_room_has_the_largest_body(self):
+        _, door, _ = self.gateway("--hold-bytes", str(96 << 20), "--hold-messages", "128")
+        # It is no list, which is found out when all of it is there.
+        self.assertEqual(door.request("POST", "/logdata", bytes(32 << 20)).status, 400)
+        for less in (["--hold-bytes", str((96 << 20) - 1)], ["--hold-messages", "127"]):
+            self.assertEqual(subprocess.run([side.program("veltra-gateway"), *less], capture_output=True, timeout=20).returncode, 2)
+
+    def test_others_are_answered_while_a_large_body_is_checked(self):
+        _, door, _ = self.gateway()
+        body = packed(plistlib.dumps(["x" * 60] * 200_000, fmt=plistlib.FMT_BINARY))  # a text of which the list has many
+        with socket.create_connection(door.address) as large:
+            begin, longest = time.monotonic(), 0
+            large.sendall(b"POST /logdata HTTP/1.1\r\nHost: h\r\nContent-Encoding: gzip\r\nContent-Length: %d\r\n\r\n%s" % (len(body), body))
+            while not select.select([large], [], [], 0.01)[0]:
+                asked = time.monotonic()
+                self.assertEqual(door.request("GET", "/events").status, 405)
+                longest = max(longest, time.monotonic() - asked)
+            self.assertIn(b"held_too_long", large.recv(1000))
+        # Without the time for which it is held.
+        self.assertLess(longest, (time.monotonic() - begin - 0.5) / 3)
 
     def test_what_has_begun_is_answered_at_the_end(self):
         process, door, line = self.gateway(hold="2")

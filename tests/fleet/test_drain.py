@@ -4,7 +4,6 @@ import os
 import pathlib
 import re
 import signal
-import socket
 import subprocess
 import time
 import urllib.request
@@ -18,17 +17,9 @@ class Drain(FleetTest):
         text = urllib.request.urlopen(self.line["drain"] + "/metrics", timeout=5).read().decode()
         return float(re.search(rf"^{name} (\S+)$", text, re.M)[1])
 
-    def talk(self, *lines):
-        """Says something to a server of the stream in its own protocol, and waits until it has been read."""
-        with socket.create_connection(("127.0.0.1", self.fleet.facts["streams"]["stream1"][0]), 10) as link:
-            link.sendall(b'CONNECT {"verbose":false,"headers":true}\r\n' + b"".join(lines) + b"PING\r\n")
-            answer = link.makefile("rb")
-            while answer.readline().strip() != b"PONG":
-                pass
-
     def put(self, subject, body, **headers):
         head = "NATS/1.0\r\n" + "".join(f"{name.replace('_', '-')}: {text}\r\n" for name, text in headers.items()) + "\r\n"
-        self.talk(f"HPUB veltra.{subject} {len(head)} {len(head) + len(body)}\r\n{head}".encode() + body + b"\r\n")
+        self.say("admin", f"HPUB veltra.{subject} {len(head)} {len(head) + len(body)}\r\n{head}".encode() + body + b"\r\n")
 
     def end(self, name, number=signal.SIGKILL):
         pid = self.fleet.facts["pids"][name]
@@ -88,6 +79,32 @@ class Drain(FleetTest):
         self.end("drain")
         self.fleet.start(["drain"])
 
+    def test_a_database_that_hangs_is_left(self):
+        self.end("drain")
+        self.fleet.facts["options"]["drain"] = ["--statement-timeout", "2"]
+        self.addCleanup(self.fleet.facts["options"].pop, "drain")
+        self.fleet.start(["drain"])
+        own = "SELECT pid FROM pg_stat_activity WHERE application_name = 'veltra-gateway drain'"
+        side.wait_until(lambda: self.metric("veltra_drain_events_total") >= 0 and self.fleet.query(own), "its session")
+        for client in ("hangs", "waits for a lock"):
+            with self.subTest(client=client):
+                before = self.metric("veltra_drain_restarts_total")
+                if client == "hangs":
+                    backend = int(self.fleet.query(own)[0][0])
+                    os.kill(backend, signal.SIGSTOP)
+                    self.addCleanup(lambda: pathlib.Path(f"/proc/{backend}").exists() and os.kill(backend, signal.SIGCONT))
+                else:
+                    session = self.holds("LOCK TABLE veltra.position", "veltra.position")
+                self.assertEqual(self.direct().post("/events", envelope({}, client=client)).status, 200)
+                side.wait_until(lambda: self.metric("veltra_drain_restarts_total") > before, "it gives the statement up", 20)
+                side.wait_until(lambda: self.metric("veltra_drain_lag_messages") >= 1, "what waits is known")
+                if client == "hangs":
+                    os.kill(backend, signal.SIGCONT)
+                else:
+                    session.kill()
+                    self.fleet.query("SELECT pg_terminate_backend(pid) FROM pg_locks WHERE relation = 'veltra.position'::regclass")
+                self.assertEqual(len(self.rows(f"SELECT 1 FROM veltra.events WHERE client_id = '{client}'", 1)), 1)
+
     def test_it_ends_in_time_also_if_the_database_does_not_answer(self):
         session = self.holds("LOCK TABLE veltra.position", "veltra.position")
         self.assertEqual(self.direct().post("/events", envelope({}, client="locked")).status, 200)
@@ -111,7 +128,26 @@ class Drain(FleetTest):
         self.assertLess(int(re.search(r"^VmHWM:\s+(\d+)", status, re.M)[1]), 128 << 10)
         self.assertEqual(self.metric("veltra_drain_restarts_total"), 0)
 
+    def test_users_that_were_refused_for_a_while_come_back(self):
+        def replace(old, new):
+            for name in side.STREAMS:
+                configuration = self.fleet.path / name / "stream.conf"
+                configuration.write_text(configuration.read_text().replace(old, new))
+                self.fleet.kill(name, signal.SIGHUP)
+        passwords = [self.fleet.secret(user).read_text().strip().split(":")[1] for user in ("gateway", "drain")]
+        before = self.metric("veltra_drain_restarts_total")
+        for password in passwords:
+            replace(password, "not " + password)
+        logs = [self.fleet.path / f"logs/{name}.log" for name in side.GATEWAYS]
+        side.wait_until(lambda: all("refuse this connection for good" in log.read_text() for log in logs), "the gateways' end")
+        side.wait_until(lambda: self.metric("veltra_drain_restarts_total") > before + 2, "the drain's end")
+        for password in passwords:
+            replace("not " + password, password)
+        for gateway in (0, 1):
+            side.wait_until(lambda: self.direct(gateway).post("/events", envelope({"n": gateway}, client="refused")).status == 200, "an answer")
+        self.rows("SELECT DISTINCT fields FROM veltra.events WHERE client_id = 'refused'", 2)
+
     def test_a_stream_that_was_made_anew_is_read_from_its_start(self):
-        self.talk(b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
+        self.say("admin", b"PUB $JS.API.STREAM.DELETE.VELTRA _INBOX.1 0\r\n\r\n")
         side.wait_until(lambda: self.direct().post("/events", envelope({}, client="anew")).status == 200, "a new stream")
         self.rows("SELECT 1 FROM veltra.events WHERE client_id = 'anew'", 1)

@@ -266,7 +266,7 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
         assert not (self.box.path / "usr/libexec/veltrad").exists()
         assert (self.box.path / "etc/veltrad/ca.pem").exists(), "removal alone keeps the configuration"
         self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
-        self.box.run("rm -r /srv/veltra /etc/systemd/system/veltra-gateway.service.d /etc/postgresql/15/main/conf.d/veltra.conf")
+        self.box.run("rm -r /srv/veltra /etc/systemd/system/veltra-gateway*.service.d /etc/postgresql/15/main/conf.d/veltra.conf")
         left = self.box.run("find / /run -xdev -name '*veltra*' -not -path '/packages/*' -o -xdev -name mobile").split()
         assert not left, left
         assert "0 loaded" in self.box.run("systemctl list-units --failed 'veltra*'")

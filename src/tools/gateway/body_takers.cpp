@@ -20,11 +20,15 @@ namespace {
 constexpr PropertyListLimits kLogDataLimits{32u << 20, 64, 500'000, 32u << 20};
 constexpr std::size_t kLocationDigits = 32;
 
+// A larger envelope is checked aside: one of this size takes some milliseconds. Log data always are, because
+// a short list can hold the same long text many times.
+constexpr std::size_t kLongTurnBytes = 64u << 10;
+
 using Answering = std::function<void(Answer)>;
 
 // The message's ID and, where the device has sent one, the post's.
-void identify(Message& message, const Wanted& wanted, std::string digest) {
-  message.id = wanted.postID.empty() ? std::move(digest) : wanted.postID;
+void identify(Message& message, const Wanted& wanted, const std::string& digest) {
+  message.id = wanted.postID.empty() ? digest : wanted.postID;
   if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
 }
 
@@ -66,6 +70,12 @@ class EventsTaker final : public BodyTaker {
 
   void finish(Answering answering) override {
     if (auto refusal = _body.end()) return answering(std::move(*refusal));
+    if (_body.text().size() <= kLongTurnBytes) return check(std::move(answering));
+    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  }
+
+ private:
+  void check(Answering answering) {
     const auto envelope = parseEnvelope(_body.text());
     if (!envelope) return answering(_services.refusals.malformed("events", envelope.error(), _body.text()));
     const std::uint64_t count = envelope.value().events.size();
@@ -78,7 +88,6 @@ class EventsTaker final : public BodyTaker {
                  answeringWith(_services, Answer{}, _services.metrics.posts, count, std::move(answering)));
   }
 
- private:
   const DoorServices& _services;
   const Wanted _wanted;
   ReceivedBody _body;
@@ -96,19 +105,23 @@ class LogDataTaker final : public BodyTaker {
 
   void finish(Answering answering) override {
     if (auto refusal = _body.end()) return answering(std::move(*refusal));
+    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  }
+
+ private:
+  void check(Answering answering) {
     auto text = json();
     if (!text) return answering(std::move(text.error()));
-    std::string digest = digestOf(_wanted.path, _body.text());
+    const std::string digest = digestOf(_wanted.path, _body.text());
     const std::string location = "/logdata/" + digest.substr(0, kLocationDigits);
     Message message{subject::kLogData, "", {{header::kLocation, location}}, std::move(text).value()};
-    identify(message, _wanted, std::move(digest));
+    identify(message, _wanted, digest);
     if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
     publishWhole(_services.publisher, std::move(message),
                  answeringWith(_services, Answer{200, location, "text/plain", {}}, _services.metrics.logData,
                                0, std::move(answering)));
   }
 
- private:
   // As JSON a list can be many times as long, so more than the bound is never written.
   Result<std::string, Answer> json() {
     const auto list = formats::parsePropertyList(_body.text(), kLogDataLimits);
@@ -141,7 +154,7 @@ class FileTaker final : public BodyTaker {
         _pieces(services.publisher) {
     _message.add(_wanted.path);
     // A content that begins like the end of another path is another file.
-    _message.add(std::string_view("", 1));
+    _message.add(std::string_view("\0", 1));
   }
 
   std::optional<Answer> take(std::string_view& bytes) override {

@@ -25,8 +25,6 @@ namespace {
 constexpr std::size_t kDatagramStackBytes = 256u << 10;
 constexpr int kReceiveBytes = 8 << 20;
 constexpr int kDatagramsAtOnce = 256;
-// A flood of datagrams leaves room for posts.
-constexpr int kMostUnderWay = 8'192;
 
 std::optional<sockaddr_in> addressOf(const std::string& text) {
   const std::size_t colon = text.rfind(':');
@@ -160,7 +158,7 @@ bool DatagramDoor::receive(char* room, std::size_t size) {
 
 void DatagramDoor::handle(const Sender& sender, std::string_view datagram) {
   if (const char* fault = faultName(datagram)) return _metrics.datagrams.add(fault);
-  if (_socket->underWay.fetch_add(1) >= kMostUnderWay) {
+  if (_socket->underWay.fetch_add(1) >= _most) {
     _socket->underWay.fetch_sub(1);
     return _metrics.datagrams.add("no_room");
   }

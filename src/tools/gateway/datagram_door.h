@@ -22,8 +22,10 @@ Message messageOfDatagram(std::string_view datagram);
 
 class DatagramDoor {
  public:
-  // The publisher and the metrics must outlive it.
-  DatagramDoor(Publisher& publisher, Metrics& metrics) : _publisher(publisher), _metrics(metrics) {}
+  // The publisher and the metrics must outlive it. `most`: what waits for the stream, so that a flood leaves
+  // room for posts.
+  DatagramDoor(Publisher& publisher, Metrics& metrics, std::size_t most)
+      : _publisher(publisher), _metrics(metrics), _most(most) {}
   ~DatagramDoor() { stop(); }
 
   // Binds to "ADDRESS:PORT" (IPv4), which other gateways may share, and serves. Returns the address with the
@@ -36,7 +38,7 @@ class DatagramDoor {
   // Outlives the door where completions still hold it.
   struct Socket {
     FileDescriptor descriptor;
-    std::atomic<int> underWay{0};
+    std::atomic<std::size_t> underWay{0};
   };
   // Whom to answer, and from which of the machine's addresses.
   struct Sender {
@@ -51,6 +53,7 @@ class DatagramDoor {
 
   Publisher& _publisher;
   Metrics& _metrics;
+  const std::size_t _most;
   std::shared_ptr<Socket> _socket = std::make_shared<Socket>();
   FileDescriptor _stopping;
   // By the kernel, so far; its number wraps.

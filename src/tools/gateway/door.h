@@ -2,6 +2,7 @@
 // The door for devices' requests: which path takes what, and who takes the body.
 #pragma once
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -29,12 +30,16 @@ struct BodyBounds {
   std::uint64_t othersTogether = 128u << 20;
 };
 
+// Runs a long turn where it keeps nobody waiting, on any thread, now or later.
+using Aside = std::function<void(std::function<void()>)>;
+
 // What those who take bodies use. All of it must outlive them.
 struct DoorServices {
   Publisher& publisher;
   Metrics& metrics;
   Refusals& refusals;
   BodyBounds bounds;
+  Aside aside;
 };
 
 enum class Place { events, upload, logData };
@@ -57,11 +62,11 @@ Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& boun
 // On the server's thread.
 class Door {
  public:
-  Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed)
+  Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed, Aside aside)
       : _refusals(publisher, metrics, shed),
         _events(bounds.eventsTogether),
         _others(bounds.othersTogether),
-        _services{publisher, metrics, _refusals, bounds} {}
+        _services{publisher, metrics, _refusals, bounds, std::move(aside)} {}
 
   std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
 

@@ -114,7 +114,7 @@ void Drain::run() {
     if (why.empty()) continue;
     ++_counts.restarts;
     if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
-    if (!looking) {
+    if (!looking || looking->isOver()) {
       if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
     }
     if (looking) measure(*looking);
@@ -132,7 +132,8 @@ void Drain::measure(StreamReader& reader) {
 }
 
 std::string Drain::runOnce() {
-  auto database = Database::open(_given.database);
+  auto database = Database::open(
+      _given.database, std::chrono::milliseconds(static_cast<std::int64_t>(_given.statement * 1'000)));
   if (!database) return database.error().detail;
   auto active = TableWriter::becomeActive(*database.value(), _stream.name);
   if (!active) return active.error().detail;
@@ -153,8 +154,8 @@ std::string Drain::runOnce() {
 
 std::string Drain::carry(StreamReader& reader, TableWriter& writer) {
   auto state = reader.state();
-  while (!state && pause(kBetweenTries)) state = reader.state();
-  if (!state) return "";
+  while (!state && !reader.isOver() && pause(kBetweenTries)) state = reader.state();
+  if (!state) return stopping() ? "" : state.error();
   const auto place = findPlace(reader, writer, state.value());
   if (!place) return place.error();
   if (stopping()) return "";
@@ -164,7 +165,9 @@ std::string Drain::carry(StreamReader& reader, TableWriter& writer) {
   _purges = PurgePlan(std::chrono::duration<double>(_given.purgeAfter));
   if (_reached > 0) _purges.reached(_reached, std::chrono::steady_clock::now());
   if (auto begun = reader.startBehind(_reached); !begun) return begun.error();
-  logInfo("drain: reads %s behind %llu", _stream.name.c_str(), static_cast<unsigned long long>(_reached));
+  if (const auto line =
+          _begins.happened("drain: reads " + _stream.name + " behind " + std::to_string(_reached)))
+    logInfo("%s", line->c_str());
   _counts.active = true;
   std::int64_t read = 0;
   while (!stopping()) {
@@ -216,7 +219,7 @@ Result<std::uint64_t, std::string> Drain::findPlace(StreamReader& reader, TableW
                  static_cast<unsigned long long>(state.firstSeq), static_cast<unsigned long long>(seq));
     return seq;
   }
-  const auto common = placeUpTo(reader, state, seq, time);
+  auto common = placeUpTo(reader, state, seq, time);
   if (!common) return common;
   logWarning("drain: the stream has lost its messages from %llu to %llu, which the tables have",
              static_cast<unsigned long long>(common.value() + 1), static_cast<unsigned long long>(seq));
@@ -269,7 +272,9 @@ void Drain::keepHouse(StreamReader& reader, TableWriter& writer, std::int64_t re
 
 int drain(const Arguments& given) {
   blockStopSignals();
-  Drain carrying(streamOptions(given.stream), given.drain);
+  StreamOptions stream = streamOptions(given.stream);
+  stream.inbox = "_INBOX.veltra-drain";
+  Drain carrying(std::move(stream), given.drain);
   const DrainCounts& counts = carrying.counts();
   Admin admin({[&counts] { return counts.active ? "" : "it does not read the stream"; },
                [&counts] { return counts.text(); }});

@@ -16,6 +16,7 @@
 #include "gateway/piece_store.h"
 #include "gateway/stream_reader.h"
 #include "gateway/table_writer.h"
+#include "platform/limited_line.h"
 
 namespace veltrad::gateway {
 
@@ -95,6 +96,7 @@ class Drain {
   const DrainArguments _given;
   PieceStore _files;
   DrainCounts _counts;
+  platform::LimitedLine _begins{"beginnings"};
   // Of the stream that is being read.
   PurgePlan _purges;
   std::chrono::steady_clock::time_point _nextForgetting{};

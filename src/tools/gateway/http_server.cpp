@@ -11,7 +11,9 @@
 #include <future>
 #include <set>
 
+#include "base/file_descriptor.h"
 #include "gateway/http_connection.h"
+#include "platform/daemon_lock.h"
 #include "platform/limited_line.h"
 #include "platform/log.h"
 
@@ -52,7 +54,9 @@ struct HTTPServer::Library : HTTPConnection::Owner {
 
   // One thread runs the context, so nothing here is locked. The context is destroyed before what its
   // connections use.
+  // Of a Unix socket; empty: it is none.
   std::string path;
+  FileDescriptor lock;
   std::set<HTTPConnection*> connections;
   std::atomic<std::size_t> count{0};
   std::function<void()> stopped;
@@ -126,13 +130,17 @@ Result<std::string, std::string> HTTPServer::listen(const std::string& address) 
   asio::generic::stream_protocol::endpoint endpoint;
   std::string host;
   if (address.starts_with("unix:")) {
-    _library->path = address.substr(5);
-    if (_library->path.empty() || _library->path.size() >= sizeof(sockaddr_un::sun_path))
+    const std::string path = address.substr(5);
+    if (path.empty() || path.size() >= sizeof(sockaddr_un::sun_path))
       return Failure{address + ": a socket's path has 1 to 107 bytes"};
+    // Whoever has the lock may remove a socket, because nobody listens to it.
+    auto lock = platform::takeDaemonLock(path + ".lock");
+    if (!lock) return Failure{address + ": " + lock.error().description};
+    _library->lock = std::move(lock).value();
+    _library->path = path;
     struct stat left {};
-    if (::lstat(_library->path.c_str(), &left) == 0 && S_ISSOCK(left.st_mode))
-      ::unlink(_library->path.c_str());
-    endpoint = asio::local::stream_protocol::endpoint(_library->path);
+    if (::lstat(path.c_str(), &left) == 0 && S_ISSOCK(left.st_mode)) ::unlink(path.c_str());
+    endpoint = asio::local::stream_protocol::endpoint(path);
   } else {
     const auto parts = hostAndPortOf(address);
     boost::system::error_code wrong;

@@ -38,7 +38,8 @@ struct Answer {
   std::vector<std::pair<std::string, std::string>> headers;
 };
 
-// Takes the body of one request. Used on the server's thread, which destroys it.
+// Takes the body of one request. Used on the server's thread, which destroys it, and not before the answer
+// that it owes.
 class BodyTaker {
  public:
   virtual ~BodyTaker() = default;
@@ -71,7 +72,7 @@ class HTTPServer {
   ~HTTPServer();
 
   // Listens on "HOST:PORT" or "unix:PATH", and returns the same with the port that was given for port 0. The
-  // error names what was expected.
+  // error names what was expected. "PATH.lock" says that somebody listens at PATH; it stays.
   Result<std::string, std::string> listen(const std::string& address);
   // Takes no further connections or requests; what has begun is answered. Then calls `done`. Any thread.
   void stop(std::function<void()> done);

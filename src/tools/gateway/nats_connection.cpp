@@ -4,7 +4,10 @@
 
 #include <nats/nats.h>
 
+#include <cerrno>
 #include <chrono>
+#include <cstring>
+#include <fstream>
 
 #include "platform/log.h"
 
@@ -27,6 +30,18 @@ struct FreeOptions {
 };
 using OwnedOptions = std::unique_ptr<natsOptions, FreeOptions>;
 
+// A user's name and password are read once; of the other form the library reads the file when it connects.
+Result<natsStatus, std::string> applyCredentials(natsOptions* made, const std::string& path) {
+  errno = 0;
+  std::ifstream file(path);
+  std::string line;
+  if (!std::getline(file, line))
+    return Failure{path + ": " + (errno == 0 ? "it is empty" : std::strerror(errno))};
+  const std::size_t colon = line.find(':');
+  if (colon == std::string::npos) return natsOptions_SetUserCredentialsFromFiles(made, path.c_str(), nullptr);
+  return natsOptions_SetUserInfo(made, line.substr(0, colon).c_str(), line.substr(colon + 1).c_str());
+}
+
 natsStatus applyOptions(natsOptions* made, const StreamOptions& given) {
   std::vector<const char*> servers;
   for (const std::string& server : given.servers) servers.push_back(server.c_str());
@@ -42,8 +57,7 @@ natsStatus applyOptions(natsOptions* made, const StreamOptions& given) {
   then(natsOptions_SetWriteDeadline(made, kWriteMilliseconds));
   then(natsOptions_SetPingInterval(made, kPingMilliseconds));
   then(natsOptions_SetMaxPingsOut(made, kMostPingsOut));
-  if (!given.credentials.empty())
-    then(natsOptions_SetUserCredentialsFromFiles(made, given.credentials.c_str(), nullptr));
+  then(natsOptions_SetCustomInboxPrefix(made, given.inbox.c_str()));
   if (given.ca.empty()) return status;
   then(natsOptions_LoadCATrustedCertificates(made, given.ca.c_str()));
   then(natsOptions_SetSecure(made, true));
@@ -78,6 +92,11 @@ Result<std::unique_ptr<NATSConnection>, std::string> NATSConnection::open(const 
   natsStatus status = natsOptions_Create(&made);
   const OwnedOptions owned(made);
   if (status == NATS_OK) status = applyOptions(made, options);
+  if (status == NATS_OK && !options.credentials.empty()) {
+    const auto applied = applyCredentials(made, options.credentials);
+    if (!applied) return Failure{"--credentials " + applied.error()};
+    status = applied.value();
+  }
   if (status == NATS_OK) status = natsOptions_SetReconnectedCB(made, &NATSCallbacks::connected, self.get());
   if (status == NATS_OK) status = natsOptions_SetDisconnectedCB(made, &NATSCallbacks::disconnected, nullptr);
   if (status == NATS_OK) status = natsOptions_SetClosedCB(made, &NATSCallbacks::closed, self.get());
@@ -100,6 +119,10 @@ NATSConnection::~NATSConnection() {
   natsConnection_Close(_connection);
   _closed.get_future().wait_for(kLongestClose);
   natsConnection_Destroy(_connection);
+}
+
+bool NATSConnection::isOver() const {
+  return natsConnection_IsClosed(_connection);
 }
 
 bool NATSConnection::connected() const {

@@ -26,9 +26,12 @@ struct StreamOptions {
   int copies = 3;
   // What the stream may hold; beyond it the stream takes nothing. 0: no bound.
   std::int64_t mostBytes = 0;
-  // Files with a user's credentials, and with the certificates that the servers' are signed by; empty: none.
+  // Files with a user's credentials (a line "NAME:PASSWORD", or what the servers' own tools write), and with
+  // the certificates that the servers' are signed by; empty: none.
   std::string credentials;
   std::string ca;
+  // What stands before the subjects of answers, so that no user needs to see those to others.
+  std::string inbox = "_INBOX.veltra-gateway";
 };
 
 // Closes the connection when it is destroyed. Any thread.
@@ -40,6 +43,9 @@ class NATSConnection {
   ~NATSConnection();
 
   bool connected() const;
+  // It will not be connected again, as after two refusals of the user's password in a row: only another one
+  // can be.
+  bool isOver() const;
   __natsConnection* get() const { return _connection; }
   __jsCtx* jetStream() const { return _jetStream; }
 

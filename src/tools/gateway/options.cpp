@@ -28,6 +28,10 @@ Examples:
   veltra-gateway drain --database 'dbname=veltra' --files /srv/veltra/files
   curl http://127.0.0.1:8081/metrics)";
 
+// The largest body finds room in half of it, and its pieces, at most 35, beside others.
+constexpr std::size_t kLeastHoldBytes = std::size_t{96} << 20;
+constexpr std::size_t kLeastHoldMessages = 128;
+
 constexpr const char* kNameCharacters = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_-";
 
 std::string faultOfStreamName(const std::string& name) {
@@ -56,7 +60,9 @@ void describeStream(CLI::App& app, StreamArguments& given) {
       ->type_name("TEXT")
       ->check(&faultOfPrefix)
       ->capture_default_str();
-  app.add_option("--credentials", given.credentials, "File with the credentials of the stream's user")
+  app.add_option("--credentials", given.credentials,
+                 "File with the credentials of the stream's user: a line NAME:PASSWORD, or what the servers' "
+                 "tools write")
       ->type_name("FILE");
   app.add_option("--ca", given.ca, "File with the certificates that sign those of the stream's servers")
       ->type_name("FILE");
@@ -88,11 +94,11 @@ void describeServing(CLI::App& app, ServeArguments& given) {
          "--hold-bytes", given.holdBytes,
          "What is held together; as much for events from their head to the answer, half of it for the rest")
       ->type_name("BYTES")
-      ->check(CLI::Range(std::size_t{64} << 20, std::size_t{1} << 40))
+      ->check(CLI::Range(kLeastHoldBytes, std::size_t{1} << 40))
       ->capture_default_str();
   app.add_option("--hold-messages", given.holdMessages, "How many messages are held")
       ->type_name("N")
-      ->check(CLI::Range(std::size_t{1}, std::size_t{1} << 20))
+      ->check(CLI::Range(kLeastHoldMessages, std::size_t{1} << 20))
       ->capture_default_str();
   app.add_option("--connections", given.connections, "How many connections are open at once")
       ->type_name("N")
@@ -120,6 +126,11 @@ void describeDrain(CLI::App& app, Arguments& given) {
   app.add_option("--batch", drain.batch, "Most messages in one transaction")
       ->type_name("N")
       ->check(CLI::Range(1, 10'000))
+      ->capture_default_str();
+  app.add_option("--statement-timeout", drain.statement,
+                 "Seconds that a statement of the database may take; housekeeping has half an hour")
+      ->type_name("SECONDS")
+      ->check(CLI::Range(0.1, 1'800.0))
       ->capture_default_str();
   app.add_option(
          "--purge-after", drain.purgeAfter,

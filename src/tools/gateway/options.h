@@ -38,6 +38,7 @@ struct DrainArguments {
   std::string database;
   std::string files = "files";
   int batch = 1'000;
+  double statement = 60;
   double purgeAfter = 150;
   double postDays = 8;
   double keepDays = 0;

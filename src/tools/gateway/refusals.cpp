@@ -32,6 +32,11 @@ bool KeepingRate::allows(Time now) {
   return _kept++ < kMostASecond;
 }
 
+bool Refusals::isKept() {
+  const Lock hold(_mutex);
+  return _rate.allows(std::chrono::steady_clock::now());
+}
+
 Answer Refusals::answer(const Refusal& refusal) {
   _metrics.refused.add(refusal.reason);
   Answer answer{refusal.status, "", "", {{kRefusedHeader, asHeader(refusal.detail)}}};
@@ -40,7 +45,7 @@ Answer Refusals::answer(const Refusal& refusal) {
 }
 
 Answer Refusals::malformed(const char* reason, const std::string& detail, std::string_view body) {
-  if (_rate.allows(std::chrono::steady_clock::now())) {
+  if (isKept()) {
     Message message{
         subject::kRefused,
         "refused " + platform::randomUUIDText(),

@@ -7,6 +7,7 @@
 #include <string>
 #include <string_view>
 
+#include "base/mutex.h"
 #include "gateway/http_server.h"
 #include "gateway/publisher.h"
 
@@ -32,7 +33,7 @@ class KeepingRate {
   int _kept = 0;
 };
 
-// Used on the server's thread. The publisher and the metrics must outlive it.
+// Any thread. The publisher and the metrics must outlive it.
 class Refusals {
  public:
   static constexpr std::size_t kMostKeptBytes = 64u << 10;
@@ -44,14 +45,17 @@ class Refusals {
   Answer answer(const Refusal& refusal);
   // The same for a body that is malformed, which is kept apart.
   Answer malformed(const char* reason, const std::string& detail, std::string_view body);
-  // For what the stream has not taken, or that there is no room for. Any thread.
+  // For what the stream has not taken, or that there is no room for.
   Answer busy(const char* reason);
 
  private:
+  bool isKept();
+
   Publisher& _publisher;
   Metrics& _metrics;
   const int _shed;
-  KeepingRate _rate;
+  Mutex _mutex LEAF_LOCK{LockRank::leaf};
+  KeepingRate _rate GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::gateway

@@ -14,6 +14,7 @@
 #include "gateway/admin.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
+#include "gateway/work_queue.h"
 #include "platform/service_manager.h"
 
 namespace veltrad::gateway {
@@ -121,12 +122,15 @@ int serve(const Arguments& given) {
   if (!opened) return failed(opened.error());
   // Destroyed first, so that no completion comes after what it uses.
   std::unique_ptr<Publisher> publisher = std::move(opened).value();
-  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed);
+  WorkQueue bodies;
+  if (!bodies.start()) return failed("a thread cannot be started");
+  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
+            [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
   HTTPServer server([&door](const RequestHead& head) { return door.request(head); },
                     {.connections = given.serve.connections});
   const auto listen = server.listen(given.serve.listen);
   if (!listen) return failed("--listen " + listen.error());
-  DatagramDoor datagrams(*publisher, metrics);
+  DatagramDoor datagrams(*publisher, metrics, given.serve.holdMessages / 2);
   Dictionary line{{"listen", asURL(listen.value())}, {"pid", static_cast<long>(::getpid())}};
   if (!given.serve.dashboard.empty()) {
     const auto bound = datagrams.start(given.serve.dashboard);
@@ -153,6 +157,7 @@ int serve(const Arguments& given) {
   admin.reset();
   server.end();
   serving.join();
+  bodies.end();
   publisher.reset();
   return 0;
 }

@@ -6,11 +6,13 @@
 
 #include <charconv>
 #include <chrono>
+#include <future>
 #include <optional>
 #include <string_view>
 
 #include "formats/json.h"
 #include "platform/log.h"
+#include "platform/uuid.h"
 
 namespace veltrad::gateway {
 
@@ -48,40 +50,70 @@ std::string refusalInAnswer(std::string_view text) {
   return seq && seq->toInt64().value_or(0) > 0 ? "" : "an answer without a place in the stream";
 }
 
-struct StreamCallbacks {
-  static void answered(natsConnection*, natsSubscription*, natsMsg* answer, void* closure) {
-    const auto* self = static_cast<Stream*>(closure);
-    const std::string_view subject = natsMsg_GetSubject(answer);
-    std::uint64_t token = 0;
-    if (subject.size() > self->_inbox.size())
-      std::from_chars(subject.data() + self->_inbox.size(), subject.data() + subject.size(), token);
-    self->_listener.answered(token, refusalIn(answer));
-    natsMsg_Destroy(answer);
-  }
-  static void unsubscribed(void* closure) { static_cast<Stream*>(closure)->_unsubscribed.set_value(); }
+// A connection and the subscription to the answers.
+struct Stream::Link {
+  static Result<std::shared_ptr<Link>, std::string> open(const StreamOptions& options,
+                                                         const Listener& listener);
+  explicit Link(const Listener& listening) : listener(listening) {}
+  ~Link();
+
+  static void answered(natsConnection*, natsSubscription*, natsMsg* answer, void* closure);
+  static void unsubscribedNow(void* closure) { static_cast<Link*>(closure)->unsubscribed.set_value(); }
+
+  const Listener& listener;
+  std::unique_ptr<NATSConnection> connection;
+  natsSubscription* answers = nullptr;
+  // Answers to a message come to this and its token.
+  std::string inbox;
+  // No answer follows.
+  std::promise<void> unsubscribed;
 };
+
+void Stream::Link::answered(natsConnection*, natsSubscription*, natsMsg* answer, void* closure) {
+  const auto* self = static_cast<Link*>(closure);
+  const std::string_view subject = natsMsg_GetSubject(answer);
+  std::uint64_t token = 0;
+  if (subject.size() > self->inbox.size())
+    std::from_chars(subject.data() + self->inbox.size(), subject.data() + subject.size(), token);
+  self->listener.answered(token, refusalIn(answer));
+  natsMsg_Destroy(answer);
+}
+
+Result<std::shared_ptr<Stream::Link>, std::string> Stream::Link::open(const StreamOptions& options,
+                                                                      const Listener& listener) {
+  auto made = std::make_shared<Link>(listener);
+  auto connection = NATSConnection::open(options, listener.back);
+  if (!connection) return Failure{std::move(connection.error())};
+  made->connection = std::move(connection).value();
+  made->inbox = options.inbox + "." + platform::randomUUIDText() + ".";
+  natsStatus status = natsConnection_Subscribe(&made->answers, made->connection->get(),
+                                               (made->inbox + "*").c_str(), &Link::answered, made.get());
+  if (status == NATS_OK)
+    status = natsSubscription_SetOnCompleteCB(made->answers, &Link::unsubscribedNow, made.get());
+  if (status == NATS_OK) status = natsSubscription_SetPendingLimits(made->answers, kMostAnswersWaiting, -1);
+  if (status != NATS_OK) return Failure{std::string("no answers can be read: ") + natsStatus_GetText(status)};
+  return made;
+}
+
+Stream::Link::~Link() {
+  if (!answers) return;
+  natsSubscription_Unsubscribe(answers);
+  unsubscribed.get_future().wait_for(kLongestUnsubscribe);
+  natsSubscription_Destroy(answers);
+}
 
 Stream::Stream(StreamOptions options, Listener listener)
     : _options(std::move(options)), _listener(std::move(listener)) {}
 
 Result<std::unique_ptr<Stream>, std::string> Stream::open(StreamOptions options, Listener listener) {
   std::unique_ptr<Stream> self(new Stream(std::move(options), std::move(listener)));
-  auto connection = NATSConnection::open(self->_options, self->_listener.back);
-  if (!connection) return Failure{std::move(connection.error())};
-  self->_connection = std::move(connection).value();
-  natsInbox* inbox = nullptr;
-  natsStatus status = natsInbox_Create(&inbox);
-  if (status == NATS_OK) {
-    self->_inbox = std::string(inbox) + ".";
-    natsInbox_Destroy(inbox);
-    status = natsConnection_Subscribe(&self->_answers, self->_connection->get(), (self->_inbox + "*").c_str(),
-                                      &StreamCallbacks::answered, self.get());
-  }
-  if (status == NATS_OK)
-    status = natsSubscription_SetOnCompleteCB(self->_answers, &StreamCallbacks::unsubscribed, self.get());
-  if (status == NATS_OK) status = natsSubscription_SetPendingLimits(self->_answers, kMostAnswersWaiting, -1);
-  if (status != NATS_OK) return Failure{std::string("no answers can be read: ") + natsStatus_GetText(status)};
+  auto link = Link::open(self->_options, self->_listener);
+  if (!link) return Failure{std::move(link.error())};
   Stream* raw = self.get();
+  {
+    const Lock hold(raw->_mutex);
+    raw->_link = std::move(link).value();
+  }
   if (!self->_watch.start("stream watch", kWatchStackBytes, [raw] { raw->watch(); }))
     return Failure{std::string("a thread cannot be started")};
   return self;
@@ -94,25 +126,37 @@ Stream::~Stream() {
   }
   _changed.notifyAll();
   _watch.join();
-  if (_answers) {
-    natsSubscription_Unsubscribe(_answers);
-    _unsubscribed.get_future().wait_for(kLongestUnsubscribe);
-    natsSubscription_Destroy(_answers);
-  }
+}
+
+std::shared_ptr<Stream::Link> Stream::link() {
+  const Lock hold(_mutex);
+  return _link;
+}
+
+void Stream::renew() {
+  if (!link()->connection->isOver()) return;
+  logWarning("stream: the servers refuse this connection for good; another one is made");
+  auto next = Link::open(_options, _listener);
+  if (!next) return;
+  std::shared_ptr<Link> made = std::move(next).value();
+  // The old one goes when nobody holds it, and not under the lock.
+  const Lock hold(_mutex);
+  _link.swap(made);
 }
 
 void Stream::publish(std::uint64_t token, const Message& message) {
-  if (!_connection->connected()) return;
+  const std::shared_ptr<Link> now = link();
+  if (!now->connection->connected()) return;
   natsMsg* made = nullptr;
   const std::string to = _options.prefix + message.subject;
-  const std::string answerTo = _inbox + std::to_string(token);
+  const std::string answerTo = now->inbox + std::to_string(token);
   natsStatus status = natsMsg_Create(&made, to.c_str(), answerTo.c_str(), message.body.data(),
                                      static_cast<int>(message.body.size()));
   if (status == NATS_OK) status = natsMsgHeader_Set(made, header::kMessageID, message.id.c_str());
   for (const auto& [name, text] : message.headers) {
     if (status == NATS_OK) status = natsMsgHeader_Set(made, name.c_str(), text.c_str());
   }
-  if (status == NATS_OK) status = natsConnection_PublishMsg(_connection->get(), made);
+  if (status == NATS_OK) status = natsConnection_PublishMsg(now->connection->get(), made);
   natsMsg_Destroy(made);
   // It is published again when no answer comes.
   if (status == NATS_OK) return;
@@ -122,14 +166,16 @@ void Stream::publish(std::uint64_t token, const Message& message) {
 }
 
 std::string Stream::faultOfStream() {
-  if (!_connection->connected()) return "no server can be reached";
+  renew();
+  const std::shared_ptr<Link> now = link();
+  if (!now->connection->connected()) return "no server can be reached";
   jsOptions options;
   jsOptions_Init(&options);
   options.Wait = kAnswerMilliseconds;
   jsStreamInfo* info = nullptr;
   jsErrCode error = static_cast<jsErrCode>(0);
   natsStatus status =
-      js_GetStreamInfo(&info, _connection->jetStream(), _options.name.c_str(), &options, &error);
+      js_GetStreamInfo(&info, now->connection->jetStream(), _options.name.c_str(), &options, &error);
   if (status == NATS_NOT_FOUND && error == JSStreamNotFoundErr) {
     const std::string all = _options.prefix + ">";
     const char* subjects[] = {all.c_str()};
@@ -143,7 +189,7 @@ std::string Stream::faultOfStream() {
     wanted.Replicas = _options.copies;
     wanted.Duplicates = kDuplicatesNanoseconds;
     if (_options.mostBytes > 0) wanted.MaxBytes = _options.mostBytes;
-    status = js_AddStream(&info, _connection->jetStream(), &wanted, &options, &error);
+    status = js_AddStream(&info, now->connection->jetStream(), &wanted, &options, &error);
     if (status == NATS_OK)
       logInfo("stream: %s is made, with %d copies", _options.name.c_str(), _options.copies);
   }

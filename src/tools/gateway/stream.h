@@ -5,7 +5,6 @@
 #include <atomic>
 #include <cstdint>
 #include <functional>
-#include <future>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -16,8 +15,6 @@
 #include "gateway/message.h"
 #include "gateway/nats_connection.h"
 #include "platform/limited_line.h"
-
-struct __natsSubscription;
 
 namespace veltrad::gateway {
 
@@ -46,24 +43,22 @@ class Stream {
   bool ready() const { return _ready.load(std::memory_order_relaxed); }
 
  private:
-  friend struct StreamCallbacks;
+  struct Link;
   Stream(StreamOptions options, Listener listener);
+  std::shared_ptr<Link> link();
   void watch();
+  // Makes another connection where this one is over.
+  void renew();
   // Why the stream is not there, as one line; empty: it is.
   std::string faultOfStream();
 
   const StreamOptions _options;
   const Listener _listener;
-  std::unique_ptr<NATSConnection> _connection;
-  __natsSubscription* _answers = nullptr;
   platform::LimitedLine _unpublished{"messages"};
-  // Answers to a message come to this and its token.
-  std::string _inbox;
   std::atomic<bool> _ready{false};
-  // No answer follows.
-  std::promise<void> _unsubscribed;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
+  std::shared_ptr<Link> _link GUARDED_BY(_mutex);
   bool _stopping GUARDED_BY(_mutex) = false;
   Thread _watch;
 };

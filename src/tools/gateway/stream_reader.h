@@ -41,6 +41,8 @@ class StreamReader {
   ~StreamReader();
 
   Result<StreamState, std::string> state();
+  // Only another reader can read.
+  bool isOver() const { return _connection->isOver(); }
   // Reads what comes behind `seq`, through a consumer that is made for it.
   Result<Done, std::string> startBehind(std::uint64_t seq);
   // The next messages, at most `most` and about 32 MiB; none if nothing has come within a second. An error,

@@ -16,7 +16,7 @@ namespace veltrad::gateway {
 
 namespace {
 
-constexpr std::int64_t kNanoseconds = 1'000'000'000;
+constexpr std::int64_t kNanosecondsOfSecond = 1'000'000'000;
 constexpr std::size_t kMostRefusedBytes = 64u << 10;
 
 std::string withoutNUL(std::string_view text) {
@@ -38,12 +38,12 @@ std::int64_t numberIn(const Dictionary& fields, std::string_view key) {
 }  // namespace
 
 std::string timestampText(std::int64_t nanoseconds) {
-  const std::time_t seconds = nanoseconds / kNanoseconds;
+  const std::time_t seconds = nanoseconds / kNanosecondsOfSecond;
   std::tm parts{};
   ::gmtime_r(&seconds, &parts);
   return fmt::format("{:04}-{:02}-{:02} {:02}:{:02}:{:02}.{:06}+00", parts.tm_year + 1900, parts.tm_mon + 1,
                      parts.tm_mday, parts.tm_hour, parts.tm_min, parts.tm_sec,
-                     nanoseconds % kNanoseconds / 1'000);
+                     nanoseconds % kNanosecondsOfSecond / 1'000);
 }
 
 std::string dayText(std::int64_t nanoseconds) {

@@ -17,6 +17,8 @@ constexpr const char* kTryLock =
     "SELECT pg_try_advisory_lock(hashtext('veltra-gateway drain'), hashtext($1))";
 // Rows are copied when they have grown to this, all in one transaction.
 constexpr std::size_t kMostRowBytes = 16u << 20;
+// Of an index that is made for rows that are there, and of forgetting.
+constexpr std::chrono::minutes kLongestHousekeeping{30};
 
 // Only digits of IDs get into statements.
 bool hasPostID(const std::string& text) {
@@ -37,9 +39,11 @@ Result<Done, StoreError> TableWriter::prepare(Database& database) {
   const auto known = database.run("SELECT obj_description(to_regnamespace('veltra')::oid, 'pg_namespace')");
   if (!known) return Failure{known.error()};
   if (!known.value().empty() && known.value().front() == mark) return Done();
-  const auto made = database.run(std::string(kSchema) + "COMMENT ON SCHEMA veltra IS '" + mark + "'");
-  if (!made) return Failure{made.error()};
-  return Done();
+  return database.within(kLongestHousekeeping, [&]() -> Result<Done, StoreError> {
+    const auto made = database.run(std::string(kSchema) + "COMMENT ON SCHEMA veltra IS '" + mark + "'");
+    if (!made) return Failure{made.error()};
+    return Done();
+  });
 }
 
 Result<TableWriter::Position, StoreError> TableWriter::position(std::int64_t created) {
@@ -72,7 +76,7 @@ Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const Taken* b
     return written;
   }
   const Taken* middle = begin + (end - begin) / 2;
-  const auto first = writeHalves(begin, middle);
+  auto first = writeHalves(begin, middle);
   if (!first) return first;
   written = writeHalves(middle, end);
   if (!written) return written;
@@ -213,6 +217,10 @@ Result<Done, StoreError> TableWriter::goBack(std::uint64_t seq) {
 }
 
 Result<Done, StoreError> TableWriter::forget(double postDays, double keepDays) {
+  return _database->within(kLongestHousekeeping, [&] { return forgetNow(postDays, keepDays); });
+}
+
+Result<Done, StoreError> TableWriter::forgetNow(double postDays, double keepDays) {
   auto forgotten =
       _database->run("DELETE FROM veltra.posts WHERE received < now() - $1::float8 * interval '1 day'",
                      {std::to_string(postDays)});

@@ -69,6 +69,7 @@ class TableWriter {
   Result<std::set<std::string>, StoreError> knownPosts(const Taken* begin, const Taken* end);
   Result<Done, StoreError> copyRows(const TableRows& rows);
   Result<Done, StoreError> advance(Position to);
+  Result<Done, StoreError> forgetNow(double postDays, double keepDays);
 
   const std::unique_ptr<Database> _database;
   PieceStore& _files;

@@ -97,7 +97,8 @@ class Room : public testing::Test {
   Room()
       : publisher(Publisher::open(unreachable(), {.bytes = kHeldBytes}, metrics).value()),
         door(*publisher, metrics,
-             {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429) {}
+             {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429,
+             [](const std::function<void()>& work) { work(); }) {}
   // No completion comes after what it uses.
   ~Room() override { publisher.reset(); }
 
@@ -153,7 +154,7 @@ TEST_F(Room, IsTakenByWhatABodyKeeps) {
 
 TEST_F(Room, IsGivenBackByABodyThatBecomesAMessage) {
   Refusals refusals(*publisher, metrics, 429);
-  const DoorServices services{*publisher, metrics, refusals, {}};
+  const DoorServices services{*publisher, metrics, refusals, {}, {}};
   ByteBudget budget(1'000'000);
   ReceivedBody body(services, Charge(budget), false, 900'000);
   const std::string text(900'000, 'x');
