@@ -13,6 +13,7 @@
 #include "config/owner_gate.h"
 #include "configuration.h"
 #include "formats/json.h"
+#include "fakes/scarce_memory.h"
 #include "platform/device_secret.h"
 
 namespace veltrad {
@@ -86,6 +87,24 @@ TEST(Policy, AShortageKeepsWhatHeldAndClosesBeforeTheFirstReading) {
 }
 
 TEST(Policy, MakesTheBackendsAndReachesTheHostsThatItNames) {
+TEST(Policy, IsReadAgainForWantOfMemoryAndNeverTakenForBroken) {
+  const std::pair<const char*, std::string> forms[] = {
+      {"/etc/veltrad/policy.json", R"({"reporting": "off", "remove": ["a long name of a field", "b"]})"},
+      {"/etc/veltrad/policy.plist", formats::writeXMLPropertyList(Dictionary{
+                                        {"reporting", "off"}, {"remove", Array{"a long name of a field"}}})}};
+  for (const auto& form : forms) {
+    forEachShortage([&](const auto& shortOfMemory) {
+      Owner owner;
+      EXPECT_EQ(owner.policy.current()->refusal(true), std::nullopt);
+      owner.files.put(form.first, form.second);
+      std::optional<wire::Reason> meanwhile;
+      shortOfMemory([&] { meanwhile = owner.policy.current()->refusal(true); });
+      EXPECT_NE(meanwhile, policy_broken);
+      EXPECT_EQ(owner.policy.current()->refusal(true), policy_reporting) << form.first;
+    });
+  }
+}
+
   Owner owner;
   EXPECT_TRUE(owner.says("{}").makes("httppost"));
   EXPECT_FALSE(owner.says(R"({"backends": []})").makes("httppost"));
