@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "config/daily_allowance.h"
+#include "config/destinations.h"
 #include "config/field_rules.h"
 #include "config/owner_gate.h"
 #include "configuration.h"
@@ -176,6 +177,55 @@ TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
   const ExpectedLog log({});
   Owner owner;
   FakeClock clock;
+TEST(Destinations, FitAFrameAndTheirFileWhateverStorebagsName) {
+  FakeClock clock;
+  FakeFileStore files;
+  config::Destinations destinations(files, clock, "/destinations");
+  constexpr std::uint64_t kHours = 24, kServers = 300;
+  for (std::uint64_t hour = 0; hour < kHours; ++hour) {
+    if (hour > 0) clock.advance(3'600);
+    for (std::uint64_t i = 0; i < kServers; ++i) {
+      const std::string url = "https://" + std::to_string(hour * 1'000 + i) + std::string(5'000, '\1') + "/x";
+      destinations.count(http::Departure::Kind::post, url, 1, hour == 0 ? 2 : 1);
+    }
+  }
+  files.put("/destinations", destinations.text());
+  config::Destinations next(files, clock, "/destinations");
+  next.load();
+  const Array all = next.lastDay();
+  EXPECT_LT(writeBinaryPropertyList(all).size(), 1'000'000u);
+  std::int64_t events = 0;
+  std::size_t ofMost = 0;
+  for (const Value& one : all) {
+    events += one.asDictionary()->find("events")->toInt64().value();
+    ofMost += one.asDictionary()->find("bytes")->toInt64() == 2 ? 1u : 0u;
+  }
+  EXPECT_EQ(events, kHours * kServers);
+  EXPECT_EQ(ofMost, config::Destinations::kMost);
+}
+
+TEST(DropReceipt, FitsAFrameWhateverProgramsCallThemselves) {
+  using Kind = http::Departure::Kind;
+  config::DropReceipt receipt;
+  receipt.begin();
+  constexpr std::int64_t kClients = 5'000;
+  for (std::int64_t i = 0; i < kClients; ++i) {
+    std::string name;
+    for (int n = 0; n < 500; ++n) name += "é";
+    receipt.add(
+        Kind::post,
+        std::make_shared<const Dictionary>(Dictionary{{"sessionID", i}, {"client", name}, {"service", name}}),
+        2);
+  }
+  const Dictionary dropped = receipt.end();
+  EXPECT_LT(writeBinaryPropertyList(dropped).size(), 1'000'000u);
+  std::int64_t events = 0;
+  for (const Value& line : *dropped.array("byClient"))
+    events += line.asDictionary()->find("events")->toInt64().value();
+  EXPECT_EQ(events, 2 * kClients);
+  EXPECT_EQ(dropped.find("events")->toInt64(), events);
+}
+
   FakePreferences preferences;
   platform::DeviceSecret secret(owner.files, "/secret");
   config::DailyAllowance day(owner.files, clock, "/daily");
