@@ -13,8 +13,8 @@
 #include "config/field_rules.h"
 #include "config/owner_gate.h"
 #include "configuration.h"
-#include "formats/json.h"
 #include "fakes/scarce_memory.h"
+#include "formats/json.h"
 #include "platform/device_secret.h"
 
 namespace veltrad {
@@ -87,7 +87,6 @@ TEST(Policy, AShortageKeepsWhatHeldAndClosesBeforeTheFirstReading) {
   EXPECT_EQ(owner.policy.current()->refusal(true), policy_reporting);
 }
 
-TEST(Policy, MakesTheBackendsAndReachesTheHostsThatItNames) {
 TEST(Policy, IsReadAgainForWantOfMemoryAndNeverTakenForBroken) {
   const std::pair<const char*, std::string> forms[] = {
       {"/etc/veltrad/policy.json", R"({"reporting": "off", "remove": ["a long name of a field", "b"]})"},
@@ -106,6 +105,7 @@ TEST(Policy, IsReadAgainForWantOfMemoryAndNeverTakenForBroken) {
   }
 }
 
+TEST(Policy, MakesTheBackendsAndReachesTheHostsThatItNames) {
   Owner owner;
   EXPECT_TRUE(owner.says("{}").makes("httppost"));
   EXPECT_FALSE(owner.says(R"({"backends": []})").makes("httppost"));
@@ -156,6 +156,9 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   EXPECT_FALSE(day.take(events, 1, 0));
   EXPECT_TRUE(day.take(events, 0, 10));
   EXPECT_FALSE(day.take(bytes, 0, 1));
+  day.giveBack(0, 5);
+  EXPECT_FALSE(day.take(bytes, 0, 6));
+  EXPECT_TRUE(day.take(bytes, 0, 5));
   files.put("/daily", day.text());
   config::DailyAllowance next(files, clock, "/daily");
   EXPECT_TRUE(next.take({}, 4, 10));
@@ -164,6 +167,7 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   EXPECT_TRUE(next.take(both, 2, 10));
   EXPECT_FALSE(next.take(both, 0, 1));
   clock.seconds += 86'400;
+  next.giveBack(1, 10);  // of the day before
   EXPECT_TRUE(next.take(both, 9, 120));
   for (const char* text : {"", "[]", R"({"day": "x"})", R"({"day": 19999, "events": 9})"}) {
     files.put("/daily", text);
@@ -173,10 +177,6 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   }
 }
 
-TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
-  const ExpectedLog log({});
-  Owner owner;
-  FakeClock clock;
 TEST(Destinations, FitAFrameAndTheirFileWhateverStorebagsName) {
   FakeClock clock;
   FakeFileStore files;
@@ -226,6 +226,10 @@ TEST(DropReceipt, FitsAFrameWhateverProgramsCallThemselves) {
   EXPECT_EQ(dropped.find("events")->toInt64(), events);
 }
 
+TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
+  const ExpectedLog log({});
+  Owner owner;
+  FakeClock clock;
   FakePreferences preferences;
   platform::DeviceSecret secret(owner.files, "/secret");
   config::DailyAllowance day(owner.files, clock, "/daily");

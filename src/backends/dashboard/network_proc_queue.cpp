@@ -49,12 +49,8 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _socket(std::move(socket)),
       _messageQueue(
           kind.reliableUDP, kind.shared,
-          [this](std::string_view datagram, bool first) REQUIRES(_mutex) {
-            using Sending = MessageQueue::Sending;
-            if (_kind.gate && !_kind.gate->hasRoomForRecord()) return Sending::notTaken;
-            if (!first && !mayLeave(0, datagram.size())) return Sending::forbidden;
-            return _socket.send(datagram) ? Sending::done : Sending::notTaken;
-          },
+          [this](std::string_view datagram, bool first)
+              REQUIRES(_mutex) { return send(datagram, first ? 1 : 0); },
           recorder(),
           [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
             note(message, step, reason);
@@ -83,11 +79,6 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
     _counters.count(wire::Reason::ended_before_sent);
     _kind.pen.write(wire::Step::dropped, wire::Reason::ended_before_sent, fate);
     return {wire::Fate::dropped, wire::Reason::ended_before_sent};
-  }
-  if (!mayLeave(1, datagram.size())) {
-    _counters.count(wire::Reason::datagram_over_daily_limit);
-    _kind.pen.write(wire::Step::dropped, wire::Reason::datagram_over_daily_limit, fate);
-    return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
   const MessageQueue::First first =
       _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner, fate.message);
@@ -122,8 +113,15 @@ void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEnt
        *first.pushedOut);
 }
 
-bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
-  return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
+// Counts it for the owner's limits of a day if the socket takes it.
+MessageQueue::Sending NetworkProcQueue::send(std::string_view datagram, std::uint64_t events) {
+  using Sending = MessageQueue::Sending;
+  config::OwnerGate* const gate = _kind.gate;
+  if (gate && !gate->hasRoomForRecord()) return Sending::notTaken;
+  if (gate && !gate->mayLeave(events, datagram.size())) return Sending::forbidden;
+  if (_socket.send(datagram)) return Sending::done;
+  if (gate) gate->didNotLeave(events, datagram.size());
+  return Sending::notTaken;
 }
 
 MessageQueue::Recorder NetworkProcQueue::recorder() const {
