@@ -5,6 +5,7 @@
 #include <endian.h>
 
 #include <cstring>
+#include <new>
 
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/reporting_packet.h"
@@ -212,15 +213,19 @@ void NetworkProcQueue::giveUp(wire::Reason reason) {
 
 void NetworkProcQueue::armTimer(DeliverySchedule::Time time) {
   const auto next = _schedule.next(time, !_messageQueue.empty());
-  _armed = next.has_value();
+  _armed = false;  // also if there is no memory for it: the next datagram arms it then
   if (next) _timer->arm(*next, [self = shared_from_this()] { self->timerFired(); });
+  _armed = next.has_value();
 }
 
 void NetworkProcQueue::timerFired() {
   const Lock held(_mutex);
   if (!_timer) return;
   const auto time = now();
-  if (_schedule.tickIsDue(time)) myPeriodicTask(time);
+  try {
+    if (_schedule.tickIsDue(time)) myPeriodicTask(time);
+  } catch (const std::bad_alloc&) {  // what there is no memory for is done at the next tick
+  }
   if (_schedule.lastResortIsDue(time)) cleanupSources();
   if (_timer) armTimer(time);
 }
