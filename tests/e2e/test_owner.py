@@ -42,7 +42,7 @@ class Collector(http.server.BaseHTTPRequestHandler):
         return server
 
 
-class Owner(PolicyTest):
+class OwnerTest(PolicyTest):
     def privacy(self, *arguments, status=0):
         return json.loads(self.ctl("privacy", *arguments, "--json", status=status)[0])
 
@@ -57,6 +57,10 @@ class Owner(PolicyTest):
         path = self.root.path / "crash.log"
         path.write_bytes(content)
         return self.ctl("upload", "--client-type", "7", "--session-id", "9", str(path), status=status)
+
+
+class Off(OwnerTest):
+    alone = True  # it measures time
 
     def test_turning_off_gives_an_exact_receipt_and_outlives_a_restart(self):
         self.lab.control(path="/dashboard", ack="drop")
@@ -96,6 +100,8 @@ class Owner(PolicyTest):
             wait_until(lambda: self.client().backends, "back ends")
             self.assertEqual(self.privacy()["reporting"], "on")
 
+
+class Owner(OwnerTest):
     def test_other_identifiers_reach_open_sessions_and_the_old_ones_are_forgotten(self):
         self.root.write("etc/veltrad/device.plist", {"ProductType": "Elm4,2", "DeviceName": "Elm"})
         self.everything("quindle", entry("phone"), entry("own", custom_clientId=1))

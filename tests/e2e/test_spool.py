@@ -72,6 +72,14 @@ class SpoolTest(HTTPSTest):
         return [number for numbers, outcomes in self.ids(**like).values() if "200" in outcomes for number in numbers
                 if number is not None]
 
+    def filled(self, *arguments, **options):
+        """A session's three posts and its start in the spool."""
+        client = self.client(*arguments, requireUserInfo=True, **options)
+        for number in range(3):
+            client.message(number=number)
+        self.settled(4)
+        return client
+
 
 class Spool(SpoolTest):
     def test_without_the_setting_nothing_is_kept_and_no_header_sent(self):
@@ -297,14 +305,8 @@ class Spool(SpoolTest):
             self.assertEqual(self.arrived(), [1, 3])
 
 
-class Owner(SpoolTest):
-    def filled(self, *arguments, **options):
-        """A session's three posts and its start in the spool."""
-        client = self.client(*arguments, requireUserInfo=True, **options)
-        for number in range(3):
-            client.message(number=number)
-        self.settled(4)
-        return client
+class Withdrawal(SpoolTest):
+    alone = True  # it measures time
 
     def test_what_may_not_leave_any_more_is_deleted_within_a_second_and_counted(self):
         self.keep(PATIENT)
@@ -341,6 +343,8 @@ class Owner(SpoolTest):
             self.assertLess(time.monotonic() - began, 1)
         self.assertEqual(self.counts()["event dropped: from the spool: no_consent"], 5)
 
+
+class Owner(SpoolTest):
     def test_an_entry_that_has_gone_and_a_limit_of_the_day_are_asked_before_a_try(self):
         self.keep(PATIENT)
         self.spoil()
