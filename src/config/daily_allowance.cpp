@@ -2,6 +2,7 @@
 // Keeps the day's account. Any thread.
 #include "config/daily_allowance.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "formats/json.h"
@@ -30,6 +31,14 @@ bool DailyAllowance::take(const PolicyRules& rules, std::uint64_t events, std::u
   _bytes += bytes;
   ++_version;
   return true;
+}
+
+void DailyAllowance::giveBack(std::uint64_t events, std::uint64_t bytes) {
+  const Lock held(_mutex);
+  beginDay();
+  _events -= std::min(_events, events);
+  _bytes -= std::min(_bytes, bytes);
+  ++_version;
 }
 
 void DailyAllowance::load() {

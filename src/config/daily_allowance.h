@@ -29,6 +29,8 @@ class DailyAllowance {
   // False, and nothing is counted, if this would go beyond a limit, or if there is one and the file has not
   // been read yet.
   bool take(const PolicyRules& rules, std::uint64_t events, std::uint64_t bytes);
+  // What was taken a moment ago is not used.
+  void giveBack(std::uint64_t events, std::uint64_t bytes);
   // What the file is to hold, and numbers that differ where that differs.
   std::string text() const;
   std::uint64_t version() const;

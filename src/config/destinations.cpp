@@ -2,9 +2,12 @@
 // Counts, and reads and writes the counts.
 #include "config/destinations.h"
 
+#include <algorithm>
 #include <cstdlib>
+#include <vector>
 
 #include "formats/json.h"
+#include "http/host_name.h"
 #include "platform/clock.h"
 #include "platform/file_store.h"
 
@@ -12,14 +15,18 @@ namespace veltrad::config {
 
 namespace {
 
-constexpr std::size_t kLargestDestinationsFile = 4u << 20;
+constexpr std::size_t kLargestDestinationsFile = 16u << 20;
+// In an answer, which is to fit a frame.
+constexpr std::size_t kMostShown = 1024;
+constexpr const char* kOther = "other";
 constexpr std::int64_t kSecondsOfAnHour = 3'600;
 constexpr std::int64_t kHours = 24;
 
 // "https://a.example:8443/x" → "https://a.example:8443"
 std::string_view addressOf(std::string_view url) {
   const std::size_t host = url.find("//");
-  return url.substr(0, url.find_first_of("/?#", host == std::string_view::npos ? 0 : host + 2));
+  url = url.substr(0, url.find_first_of("/?#", host == std::string_view::npos ? 0 : host + 2));
+  return url.substr(0, http::kMostOfAddress);
 }
 
 }  // namespace
@@ -36,7 +43,7 @@ Destinations::Counts& Destinations::countsOf(std::int64_t hour, std::string_view
   ByAddress& all = _hours[hour];
   const auto found = all.find(address);
   if (found != all.end()) return found->second;
-  return all[all.size() < kMost ? std::string(address) : "other"];
+  return all[all.size() < kMost ? std::string(address) : kOther];
 }
 
 void Destinations::count(http::Departure::Kind kind, std::string_view to, std::uint64_t events,
@@ -79,6 +86,24 @@ void Destinations::load() {
   forgetOld();
 }
 
+// Leaves those to which most bytes left.
+void Destinations::joinSmallest(ByAddress& sums) {
+  if (sums.size() <= kMostShown) return;
+  std::vector<ByAddress::const_iterator> order;
+  for (auto at = sums.cbegin(); at != sums.cend(); ++at) order.push_back(at);
+  const auto last = order.begin() + (kMostShown - 1);
+  std::nth_element(order.begin(), last, order.end(), [](const auto& a, const auto& b) {
+    return a->second[Column::bytes] > b->second[Column::bytes];
+  });
+  Counts others{};
+  for (auto at = last; at != order.end(); ++at) {
+    for (std::size_t i = 0; i < columns; ++i) others[i] += (*at)->second[i];
+    sums.erase(*at);
+  }
+  Counts& other = sums[kOther];
+  for (std::size_t i = 0; i < columns; ++i) other[i] += others[i];
+}
+
 Array Destinations::lastDay() const {
   ByAddress sums;
   {
@@ -89,6 +114,7 @@ Array Destinations::lastDay() const {
       }
     }
   }
+  joinSmallest(sums);
   Array all;
   for (const auto& [address, counts] : sums) {
     Dictionary line{{"to", address}};

@@ -34,7 +34,8 @@ class Destinations {
   void load();
   // `to`: the URL, or "udp://IP:PORT"; what follows the port does not count.
   void count(http::Departure::Kind kind, std::string_view to, std::uint64_t events, std::uint64_t bytes);
-  // [{"to": scheme, host and port, "events", "datagrams", "files", "logData", "bytes"}], by "to".
+  // [{"to": scheme, host and port, "events", "datagrams", "files", "logData", "bytes"}], by "to". Of very
+  // many, those to which least left are one, "other", too.
   Array lastDay() const;
   // What the file is to hold, and a number that grows when that changes.
   std::string text() const;
@@ -46,6 +47,7 @@ class Destinations {
   using Counts = std::array<std::uint64_t, columns>;
   using ByAddress = std::map<std::string, Counts, std::less<>>;
 
+  static void joinSmallest(ByAddress& sums);
   std::int64_t hour() const;
   void forgetOld() REQUIRES(_mutex);
   Counts& countsOf(std::int64_t hour, std::string_view address) REQUIRES(_mutex);

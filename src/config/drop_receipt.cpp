@@ -5,9 +5,32 @@
 #include <limits>
 #include <utility>
 
+#include "base/text.h"
 #include "formats/json.h"
 
 namespace veltrad::config {
+
+namespace {
+
+// Programs choose their names, and the answer is to fit a frame.
+constexpr std::size_t kMostClients = 1024;
+constexpr std::size_t kMostOfName = 128;
+
+Value shortened(const Value* value) {
+  if (!value) return std::numeric_limits<double>::quiet_NaN();
+  const std::string* text = value->asString();
+  if (!text || text->size() <= kMostOfName) return *value;
+  return std::string(withoutIncompleteEnd(std::string_view(*text).substr(0, kMostOfName))) + "…";
+}
+
+Dictionary whoseOf(const Dictionary* client) {
+  Dictionary whose;
+  for (const char* key : {"clientType", "sessionID", "client", "service"})
+    whose.set(key, shortened(client ? client->find(key) : nullptr));
+  return whose;
+}
+
+}  // namespace
 
 void DropReceipt::begin() {
   const Lock held(_mutex);
@@ -17,13 +40,13 @@ void DropReceipt::begin() {
 
 void DropReceipt::addUp(Kind kind, const std::shared_ptr<const Dictionary>& client, std::uint64_t count) {
   if (count == 0) return;
-  Dictionary whose;
-  for (const char* key : {"clientType", "sessionID", "client", "service"}) {
-    const Value* value = client ? client->find(key) : nullptr;
-    whose.set(key, value ? *value : Value(std::numeric_limits<double>::quiet_NaN()));
-  }
+  Dictionary whose = whoseOf(client.get());
   std::string text = formats::writeJSON(whose);
   const Lock held(_mutex);
+  if (_lines.size() >= kMostClients && !_lines.contains(text)) {
+    whose = whoseOf(nullptr);
+    text = formats::writeJSON(whose);
+  }
   Line& line = _lines[std::move(text)];
   line.client = std::move(whose);
   line.counts[static_cast<std::size_t>(kind)] += count;

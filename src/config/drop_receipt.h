@@ -23,7 +23,8 @@ class DropReceipt {
   void add(http::Departure::Kind kind, const std::shared_ptr<const Dictionary>& client, std::uint64_t count) {
     if (_open.load(std::memory_order_acquire)) addUp(kind, client, count);
   }
-  // {"events", "datagrams", "files", "byClient": [the client's keys and these three]}.
+  // {"events", "datagrams", "files", "byClient": [the client's keys and these three]}. Long names are cut,
+  // and of very many clients the last ones are one without a name.
   Dictionary end();
 
  private:

@@ -68,6 +68,8 @@ class OwnerGate final : public http::RequestGate {
   std::optional<http::RequestRefusal> count(const http::Departure& departure) override;
   // Counts for the limits of a day alone: a datagram, or the bytes of a transmission.
   bool mayLeave(std::uint64_t events, std::uint64_t bytes);
+  // What was counted so has not left.
+  void didNotLeave(std::uint64_t events, std::uint64_t bytes) { _allowance.giveBack(events, bytes); }
   // A datagram has been sent; `events`: 0 for its further transmissions.
   void datagramLeft(std::string_view to, std::uint64_t events, std::uint64_t bytes);
   bool keepsRecords() const override;

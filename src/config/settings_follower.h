@@ -45,8 +45,9 @@ class SettingsFollower {
       const Lock held(_mutex);
       auto content = _file.content();
       if (content && content.value() != _content) {
+        // Taken over together, or, for want of memory, at the next call.
+        _now = _meaning(*content.value(), _now, lines);
         _content = std::move(content).value();
-        _now = _meaning(*_content, _now, lines);
       }
       now = _now;
     }

@@ -13,6 +13,7 @@
 #include "base/version.h"
 #include "daemon/daemon.h"
 #include "daemon/doctor.h"
+#include "daemon/housekeeping.h"
 #include "daemon/observers.h"
 #include "ipc/listener.h"
 #include "ipc/service_socket.h"
@@ -33,11 +34,6 @@ using namespace std::chrono_literals;
 constexpr auto kStopBound = 10s;
 // What of it is left to a spool for the posts that have no answer until then.
 constexpr std::chrono::milliseconds kTimeToKeep = 3s;
-// How often the counters are written and the watchdog is fed.
-constexpr auto kTick = 1000ms;
-// How often the owner's word is read again in that time: a change and the end of what is under way, which
-// takes one more time, are done within a second.
-constexpr int kOwnerTicks = 3;
 // Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
 // may have.
 constexpr std::size_t kMostObservers = 64;
@@ -166,62 +162,20 @@ platform::StateFile::State metricsState(daemon::Observers& observers) {
   return {"The metrics", version, [&observers] { return observers.metricsText(); }};
 }
 
-struct StateFiles {
-  platform::StateFile& counters;
-  platform::StateFile& metrics;
-  platform::StateFile& allowance;
-  platform::StateFile& destinations;
-};
-
-void serve(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener,
-           const StateFiles& files, platform::RunLoop& loop) {
-  daemon::VeltradAgent& agent = daemon.agent();
-  const auto watchdog = services.serviceManager.watchdogInterval();
-  const auto tick = std::min<std::chrono::milliseconds>(watchdog.value_or(kTick), kTick);
-  // The last threads may still be ending.
-  constexpr int kTicksToReturnMemory = 3;
-  int returns = 0;
-  std::uint64_t accepted = 0;
-  int ownerTicks = 0;
-  const auto onTick = [&] {
-    daemon.privacy().hearOwner();
-    services.history.writeSoon();
-    if (++ownerTicks < kOwnerTicks) return;
-    ownerTicks = 0;
-    daemon.follower().tick();
-    daemon.startSpool();
-    services.allowance.load();
-    services.destinations.load();
-    files.counters.writeSoon();
-    files.metrics.writeSoon();
-    if (services.allowance.version() > 0) files.allowance.writeSoon();
-    if (services.destinations.version() > 0) files.destinations.writeSoon();
-    // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
-    const bool idle = agent.sessionCount() == 0 && listener.connectionCount() == 0 &&
-                      services.memory.used() == 0 && services.http.underWay() == 0;
-    // Detects sessions that came and went between two ticks.
-    const std::uint64_t acceptedNow = agent.acceptedSessions();
-    if (!idle || acceptedNow != accepted) {
-      accepted = acceptedNow;
-      returns = kTicksToReturnMemory;
-    } else if (returns > 0) {
-      --returns;
-      daemon.backends().rest();
-      platform::returnFreeMemory();
-    }
-    if (watchdog && services.http.passesEmptyTask(tick)) services.serviceManager.feedWatchdog();
-  };
-  loop.run(tick / kOwnerTicks, onTick, [&] {
-    logInfo("main: SIGHUP, configuration is read again");
-    daemon.readConfigurationAgain();
-  });
+void serve(daemon::Housekeeping& housekeeping, platform::RunLoop& loop) {
+  loop.run(
+      housekeeping.interval(), [&] { housekeeping.tick(); },
+      [&] {
+        logInfo("main: SIGHUP, configuration is read again");
+        housekeeping.readConfigurationAgain();
+      });
 }
 
 // Stops the listener first, so that every session sends its stop message; then finishes posts and datagrams;
 // then writes to the disk, the counters last. False if something still runs, so that nothing may be
 // destroyed.
 bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& listener, ipc::Listener& control,
-          const StateFiles& files) {
+          const daemon::StateFiles& files) {
   const auto deadline = std::chrono::steady_clock::now() + kStopBound;
   services.serviceManager.stopping();
   services.http.failBlockingWaits();
@@ -319,8 +273,9 @@ int main(int count, char** arguments) {
   platform::forbidExit();
   services.serviceManager.ready();
   logInfo("main: Listener resumes with sandbox, start loop.");
-  const StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
-  serve(services, daemon, listener, files, loop);
+  const daemon::StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
+  daemon::Housekeeping housekeeping(services, daemon, listener, files);
+  serve(housekeeping, loop);
 
   const bool ended = stop(services, daemon, listener, control, files);
   if (ended && countsRecord) countsRecord->told();

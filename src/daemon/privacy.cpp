@@ -62,15 +62,17 @@ void Privacy::hearOwner() {
   _graceRuns = changed;
 }
 
-// True if the word has changed.
+// True if the word has changed. What there is no memory for is done at the next call.
 bool Privacy::obey() {
-  if (!_services.gate.refresh()) return false;
+  _toBeTold = _services.gate.refresh() || _toBeTold;
+  if (!_toBeTold) return false;
   const auto word = _services.gate.word();
   logInfo("hearOwner: The owner's word has changed: %s",
           word->refusal ? wire::entryOf(*word->refusal).name.data() : "back ends may report");
   _agent.tellOwnersWord(*word);
   _factory.dropWaiting(
       [&word](const std::string& host) { return word->refusal.has_value() || !word->policy->reaches(host); });
+  _toBeTold = false;
   return true;
 }
 

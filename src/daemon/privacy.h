@@ -66,6 +66,8 @@ class Privacy {
   Mutex _mutex OWNER_LOCK;
   // The word has changed, and requests that had begun have been given until the next call.
   bool _graceRuns GUARDED_BY(_mutex) = false;
+  // The word has changed, and not everybody was told.
+  bool _toBeTold GUARDED_BY(_mutex) = false;
 };
 
 }  // namespace veltrad::daemon

@@ -10,6 +10,7 @@
 #include "base/base64.h"
 #include "base/text.h"
 #include "formats/json.h"
+#include "formats/throwing_allocator.h"
 
 namespace veltrad::formats {
 
@@ -126,7 +127,7 @@ constexpr unsigned kStrict = rapidjson::kParseIterativeFlag | rapidjson::kParseV
 template <unsigned kFlags>
 Result<Value, JSONError> parse(std::string_view text) {
   Handler handler;
-  rapidjson::Reader reader;
+  rapidjson::GenericReader<rapidjson::UTF8<>, rapidjson::UTF8<>, ThrowingAllocator> reader;
   rapidjson::MemoryStream stream(text.data(), text.size());
   const rapidjson::ParseResult result = reader.Parse<kFlags>(stream, handler);
   if (result.IsError()) {

@@ -8,6 +8,7 @@
 #include "base/text.h"
 #include "formats/json.h"
 #include "formats/json_text_writer.h"
+#include "formats/throwing_allocator.h"
 
 namespace veltrad::formats {
 
@@ -33,7 +34,8 @@ class ExcerptStream {
 };
 
 // Writes to an excerpt.
-class ExcerptWriter : public rapidjson::Writer<ExcerptStream> {
+class ExcerptWriter
+    : public rapidjson::Writer<ExcerptStream, rapidjson::UTF8<>, rapidjson::UTF8<>, ThrowingAllocator> {
  public:
   using Writer::Writer;
   void String(std::string_view text) {

@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <limits>
 #include <memory>
+#include <new>
 
 #include "base/base64.h"
 #include "base/text.h"
@@ -74,13 +75,18 @@ class ParserMemory {
         [](void* block) { current->release(block); }};
     return &kSuite;
   }
+  // There was no memory, within the limit.
+  bool isShort() const { return _isShort; }
 
  private:
   void* resize(void* block, std::size_t size) {
     const std::size_t before = malloc_usable_size(block);
     if (_used - before + size > _limit) return nullptr;
     void* resized = std::realloc(block, size);
-    if (!resized) return nullptr;
+    if (!resized) {
+      _isShort = true;
+      return nullptr;
+    }
     _used = _used - before + malloc_usable_size(resized);
     return resized;
   }
@@ -92,6 +98,7 @@ class ParserMemory {
   static thread_local ParserMemory* current;
   const std::size_t _limit;
   std::size_t _used = 0;
+  bool _isShort = false;
 };
 thread_local ParserMemory* ParserMemory::current = nullptr;
 
@@ -152,9 +159,10 @@ class Reader {
 };
 
 Result<Value, PropertyListError> Reader::read(std::string_view bytes) {
-  if (!_parser) return Failure{PropertyListError{Kind::tooLarge, "no memory for the XML parser"}};
+  if (!_parser) throw std::bad_alloc();
   setHandlers();
   const XML_Status status = XML_Parse(_parser.get(), bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
+  if (_memory.isShort()) throw std::bad_alloc();  // says nothing of the list
   if (status != XML_STATUS_OK && !failed()) {
     const XML_Error code = XML_GetErrorCode(_parser.get());
     fail(code == XML_ERROR_NO_MEMORY ? Kind::tooLarge : Kind::malformed,

@@ -341,6 +341,14 @@ std::string CurlTransfer::describe(CURLcode code) const {
   return text;
 }
 
+HTTPError CurlTransfer::stopping() {
+  try {
+    return {HTTPError::Kind::stopping, "The daemon is stopping"};
+  } catch (const std::bad_alloc&) {
+    return {HTTPError::Kind::stopping, outOfMemory().description};
+  }
+}
+
 HTTPResult CurlTransfer::timedOutWaiting() const {
   try {
     return Failure{HTTPError{HTTPError::Kind::transport,

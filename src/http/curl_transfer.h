@@ -60,7 +60,7 @@ class CurlTransfer {
   // The result for libcurl's code; reads the attached handle.
   HTTPResult result(CURLcode code);
   HTTPResult timedOutWaiting() const;
-  static HTTPError stopping() { return {HTTPError::Kind::stopping, "The daemon is stopping"}; }
+  static HTTPError stopping();
   // Does not allocate.
   static HTTPError outOfMemory() { return {HTTPError::Kind::shortage, "Out of memory"}; }
 

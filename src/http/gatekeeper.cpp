@@ -3,6 +3,7 @@
 #include "http/gatekeeper.h"
 
 #include <map>
+#include <new>
 #include <string>
 #include <utility>
 
@@ -20,6 +21,16 @@ std::optional<HTTPError> asError(std::optional<RequestRefusal> refused) {
 std::optional<HTTPError> Gatekeeper::refusalOf(const CurlTransfer& transfer) const {
   if (_gate == nullptr) return std::nullopt;
   return asError(_gate->refusal(transfer.lane() == HTTPRequest::Lane::storebag, transfer.hostName()));
+}
+
+HTTPError Gatekeeper::refusedBefore(const CurlTransfer& transfer) const {
+  try {
+    auto error = refusalOf(transfer);
+    return error ? std::move(*error)
+                 : HTTPError{HTTPError::Kind::refused, "Refused by the owner of the device"};
+  } catch (const std::bad_alloc&) {
+    return CurlTransfer::outOfMemory();
+  }
 }
 
 std::optional<HTTPError> Gatekeeper::overLimit(CurlTransfer& transfer) const {

@@ -17,6 +17,8 @@ class Gatekeeper {
 
   // Why the request may not begin or go on; nothing: it may.
   std::optional<HTTPError> refusalOf(const CurlTransfer& transfer) const;
+  // The error of one that waited and was refused a moment ago, also if the gate has opened since.
+  HTTPError refusedBefore(const CurlTransfer& transfer) const;
   // Counts the request for the day and records it, once, also if it begins anew on another connection.
   std::optional<HTTPError> overLimit(CurlTransfer& transfer) const;
   // Those that wait and may not begin.

@@ -2,10 +2,15 @@
 // The host of a URL. Any thread.
 #pragma once
 
+#include <cstddef>
 #include <string>
 #include <string_view>
 
 namespace veltrad::http {
+
+// What is remembered of an address, in bytes: more than a name that can be resolved has, with scheme and
+// port.
+constexpr std::size_t kMostOfAddress = 300;
 
 // The host that a request to this URL would contact, without port; empty if it names none. By libcurl's own
 // parser, so that nobody's idea of an address differs from where the request goes.

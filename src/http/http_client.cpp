@@ -8,8 +8,10 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
+#include <exception>
 #include <future>
 #include <new>
+#include <optional>
 #include <system_error>
 #include <thread>
 
@@ -51,7 +53,7 @@ struct CurlHTTPClient::Impl {
   void refuse(Transfers taken);
   void startNext();
   void startOne(Transfers one);
-  bool begins(CURL* easy, CurlTransfer& transfer);
+  std::optional<HTTPError> tryToStart(Transfers& one);
   Transfers takeRunning(Transfers::iterator at);
   void finish();
   void endExpired();
@@ -166,9 +168,7 @@ void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
 void CurlHTTPClient::Impl::refuse(Transfers taken) {
   while (!taken.empty()) {
     Transfers one = HTTPQueue::pop(taken, taken.begin());
-    // What was refused a moment ago is not put back if the gate has opened since.
-    const HTTPError before{HTTPError::Kind::refused, "Refused by the owner of the device"};
-    HTTPError error = gate.refusalOf(one.front()).value_or(before);
+    HTTPError error = gate.refusedBefore(one.front());
     complete(std::move(one), Failure{std::move(error)});
   }
 }
@@ -178,12 +178,16 @@ void CurlHTTPClient::Impl::answerRefusals() {
     return transfer.lane() != HTTPRequest::Lane::storebag;
   };
   for (HTTPQueue::Refusal& order : queue.takeRefusals()) {
-    std::vector<RequestUnderWay> underWay;
-    for (const CurlTransfer& transfer : running) {
-      if (leaves(transfer)) underWay.push_back(transfer.underWay());
+    try {
+      std::vector<RequestUnderWay> underWay;
+      for (const CurlTransfer& transfer : running) {
+        if (leaves(transfer)) underWay.push_back(transfer.underWay());
+      }
+      refuse(order.all ? queue.take(leaves) : gate.takeRefused(queue));
+      order.answer.set_value(std::move(underWay));
+    } catch (const std::bad_alloc&) {
+      order.answer.set_exception(std::current_exception());
     }
-    refuse(order.all ? queue.take(leaves) : gate.takeRefused(queue));
-    order.answer.set_value(std::move(underWay));
   }
 }
 
@@ -198,31 +202,28 @@ void CurlHTTPClient::Impl::startNext() {
 }
 
 void CurlHTTPClient::Impl::startOne(Transfers one) {
-  if (auto refused = gate.refusalOf(one.front())) return end(std::move(one), Failure{std::move(*refused)});
-  if (auto refused = gate.overLimit(one.front())) return end(std::move(one), Failure{std::move(*refused)});
-  Easy easy(nullptr, curl_easy_cleanup);
-  if (idleHandles.empty()) {
-    easy.reset(curl_easy_init());
-  } else {
-    easy = std::move(idleHandles.back());
-    idleHandles.pop_back();
+  std::optional<HTTPError> error;
+  try {
+    error = tryToStart(one);
+  } catch (const std::bad_alloc&) {
+    error = CurlTransfer::outOfMemory();
   }
-  if (easy && begins(easy.get(), one.front())) {
-    static_cast<void>(easy.release());  // owned by the running transfer
-    return running.splice(running.end(), one);
-  }
-  if (easy) keep(std::move(easy));
-  end(std::move(one), Failure{CurlTransfer::outOfMemory()});
+  if (error) end(std::move(one), Failure{std::move(*error)});
 }
 
-// False if there is no memory for it; then nothing has changed.
-bool CurlHTTPClient::Impl::begins(CURL* easy, CurlTransfer& transfer) {
-  try {
-    return transfer.attach(easy, connections, std::chrono::steady_clock::now()) &&
-           curl_multi_add_handle(multi.get(), easy) == CURLM_OK;
-  } catch (const std::bad_alloc&) {
-    return false;
-  }
+// Moves the only element to those that run, or returns why it may not or cannot.
+std::optional<HTTPError> CurlHTTPClient::Impl::tryToStart(Transfers& one) {
+  if (auto refused = gate.refusalOf(one.front())) return refused;
+  if (auto refused = gate.overLimit(one.front())) return refused;
+  Easy easy(idleHandles.empty() ? curl_easy_init() : idleHandles.back().release(), curl_easy_cleanup);
+  if (!idleHandles.empty()) idleHandles.pop_back();
+  const auto now = std::chrono::steady_clock::now();
+  if (!easy || !one.front().attach(easy.get(), connections, now) ||
+      curl_multi_add_handle(multi.get(), easy.get()) != CURLM_OK)
+    return CurlTransfer::outOfMemory();
+  static_cast<void>(easy.release());  // owned by the running transfer
+  running.splice(running.end(), one);
+  return std::nullopt;
 }
 
 void CurlHTTPClient::Impl::finish() {

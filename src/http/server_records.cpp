@@ -4,11 +4,13 @@
 
 #include <algorithm>
 
+#include "http/host_name.h"
+
 namespace veltrad::http {
 
 void ServerRecords::ended(const std::string& host, bool success, double now) {
   const Lock held(_mutex);
-  Entry& entry = _entries[host];
+  Entry& entry = _entries[host.substr(0, kMostOfAddress)];
   entry.lastUse = ++_uses;
   if (success) {
     entry.lastSuccess = now;

@@ -138,10 +138,10 @@ void Entitlements::refresh(Said& said) {
     return;
   }
   if (now.value() == _content) return;
-  _content = std::move(now).value();
-  ReadRules fresh = rulesIn(*_content);
-  _rules = std::move(fresh.rules);
+  ReadRules fresh = rulesIn(*now.value());
   _state = {fresh.missing, fresh.error.value_or(""), fresh.warnings, false};
+  _rules = std::move(fresh.rules);
+  _content = std::move(now).value();  // last, so that there is another attempt for want of memory
   said.error = std::move(fresh.error);
   said.warnings = std::move(fresh.warnings);
 }

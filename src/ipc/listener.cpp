@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <new>
 
 #include "ipc/out_queue.h"
 #include "ipc/peer.h"
@@ -114,7 +115,12 @@ void Listener::acceptLoop() {
       Lock lock(_mutex);
       if (_stopping) return;
     }
-    if (watched[0].revents != 0) acceptSome();
+    if (watched[0].revents == 0) continue;
+    try {
+      acceptSome();
+    } catch (const std::bad_alloc&) {
+      pause(ENOMEM);
+    }
   }
 }
 
@@ -241,14 +247,17 @@ bool Listener::startClient(std::uint64_t number, unsigned uid,
                            const std::shared_ptr<SocketConnection>& connection) {
   // The thread takes the lock before it uses its entry, which is then complete.
   Lock lock(_mutex);
-  Client& client = _clients[number];
-  client.connection = connection;
-  client.uid = uid;
   ++_clientsOfUser[uid];
-  const bool started = client.thread.start("connection", kConnectionStackBytes, [this, number, connection] {
-    runConnection(number, *connection);
-  });
-  if (!started) forget(number);
+  bool started = false;
+  try {
+    Client& client = _clients[number];
+    client.connection = connection;
+    client.uid = uid;
+    started = client.thread.start("connection", kConnectionStackBytes,
+                                  [this, number, connection] { runConnection(number, *connection); });
+  } catch (const std::bad_alloc&) {  // as without a thread
+  }
+  if (!started) forget(number, uid);
   return started;
 }
 
@@ -277,16 +286,15 @@ void Listener::runConnection(std::uint64_t number, SocketConnection& connection)
   }
   Lock lock(_mutex);
   _finished.push_back(std::move(_clients[number].thread));
-  forget(number);
+  forget(number, connection.peer().uid);
   _changed.notifyAll();
   wake();
 }
 
-void Listener::forget(std::uint64_t number) {
-  const auto client = _clients.find(number);
-  const auto count = _clientsOfUser.find(client->second.uid);
+void Listener::forget(std::uint64_t number, unsigned uid) {
+  const auto count = _clientsOfUser.find(uid);
   if (--count->second == 0) _clientsOfUser.erase(count);
-  _clients.erase(client);
+  _clients.erase(number);
 }
 
 }  // namespace veltrad::ipc

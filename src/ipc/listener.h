@@ -92,7 +92,7 @@ class Listener {
   void reap();
   void wake();
   void runConnection(std::uint64_t number, SocketConnection& connection);
-  void forget(std::uint64_t number) REQUIRES(_mutex);
+  void forget(std::uint64_t number, unsigned uid) REQUIRES(_mutex);
 
   // Constant after construction, except for the socket, which is closed when the accepting thread has ended.
   ListenerOptions _options;

@@ -85,7 +85,11 @@ void SocketConnection::takeNews() {
 void SocketConnection::run() {
   // A delegate that accepted without resume(), a session or an observer has nothing that could serve the
   // client.
-  if (_resumed && (_session || _observer)) serve();
+  try {
+    if (_resumed && (_session || _observer)) serve();
+  } catch (const std::bad_alloc&) {
+    _counters.count(wire::Reason::call_out_of_memory);
+  }
   end();
 }
 

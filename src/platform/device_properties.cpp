@@ -85,10 +85,11 @@ Result<Dictionary, FileFailure> MachineProperties::configured() {
     const auto now = _file.content();
     if (!now && !_content) return Failure{now.error()};
     if (now && now.value() != _content) {
-      fresh = _content = now.value();
+      fresh = now.value();
       const Dictionary* good =
           fresh->kind == LocalContent::Kind::good ? fresh->value.asDictionary() : nullptr;
       _list = good ? *good : Dictionary();
+      _content = fresh;  // last, so that there is another attempt for want of memory
     }
     list = _list;
   }

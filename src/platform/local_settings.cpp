@@ -72,9 +72,9 @@ Result<std::shared_ptr<const LocalContent>, FileFailure> LocalSettings::content(
   LocalContent& now = fresh.value();
   if (now.path == _jsonPath && list.value())
     now.warning = _jsonPath + " and " + _listPath + ": both are there, the first counts";
-  _stamps = stamps;
   if (!_content || !sayTheSame(*_content, now))
     _content = std::make_shared<const LocalContent>(std::move(fresh).value());
+  _stamps = stamps;  // last, so that what there was no memory for is read again
   return _content;
 }
 

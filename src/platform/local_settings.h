@@ -38,7 +38,7 @@ class LocalSettings {
 
   // What the file says now: one object until that changes, so that its owner acts on it, and logs its error
   // and warning, once. Reads when a file has changed, and costs two calls of the system otherwise. A failure
-  // is a shortage, and the file is read at the next call.
+  // is a shortage, and the file is read at the next call, as it is if std::bad_alloc is thrown.
   Result<std::shared_ptr<const LocalContent>, FileFailure> content();
   // The next content() reads, whether a file has changed or not.
   void readAgain() { _stamps.reset(); }

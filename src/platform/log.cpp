@@ -17,6 +17,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <new>
 #include <optional>
 #include <utility>
 
@@ -175,13 +176,7 @@ std::shared_ptr<const Target> exchangeTarget(std::shared_ptr<const Target> targe
   return std::exchange(state().target, std::move(target));
 }
 
-}  // namespace
-
-void write(LogLevel level, const char* format, ...) {
-  va_list arguments;
-  va_start(arguments, format);
-  std::string text = formatted(format, arguments);
-  va_end(arguments);
+void put(LogLevel level, std::string text) {
   if (!text.empty() && text.back() == '\n') text.pop_back();
   const std::string line = escapedForLog(text);
 
@@ -194,6 +189,21 @@ void write(LogLevel level, const char* format, ...) {
   }
   if (sink) return (*sink)(level, line);
   writeTo(*target, level, line);
+}
+
+}  // namespace
+
+// Does not throw, because most lines about a lack of memory are written where it was caught.
+void write(LogLevel level, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  try {
+    put(level, formatted(format, arguments));
+  } catch (const std::bad_alloc&) {
+    constexpr std::string_view kLost = "<4>A log line is lost: no memory\n";
+    [[maybe_unused]] const ssize_t written = ::write(STDERR_FILENO, kLost.data(), kLost.size());
+  }
+  va_end(arguments);
 }
 
 void setSink(Sink sink) {

@@ -25,11 +25,9 @@ bool StateFile::writeSoon() {
     if (_written == version) return true;
   }
   if (_asked.exchange(true)) return true;
-  if (_queue.put([this] { write(); }, 1) == DiskWriter::Queue::Put::noThread) {
-    _asked = false;
-    return false;
-  }
-  return true;
+  if (_queue.put([this] { write(); }, 1) == DiskWriter::Queue::Put::taken) return true;
+  _asked = false;
+  return false;
 }
 
 bool StateFile::writeLast(std::chrono::steady_clock::time_point deadline) {

@@ -35,7 +35,7 @@ class StateFile {
 
   // Queues a write if the version has changed, or the last write failed, and none is queued; never waits for
   // the disk. To be called at most once a second. Only the first failure in a row is logged. False if there
-  // is no thread to write with; the next call tries again.
+  // is no thread or memory to write with; the next call tries again.
   bool writeSoon();
   // Writes the state as it is now, after everything that is queued. False if `deadline` passed first.
   bool writeLast(std::chrono::steady_clock::time_point deadline);

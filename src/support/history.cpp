@@ -9,7 +9,7 @@
 #include <algorithm>
 #include <cstdlib>
 #include <future>
-#include <iterator>
+#include <new>
 
 #include "base/text.h"
 #include "formats/json.h"
@@ -24,6 +24,7 @@ namespace {
 constexpr std::size_t kMostJobBytes = 4096;
 constexpr std::int64_t kDaySeconds = 86'400;
 constexpr std::size_t kDigestPiece = 64u << 10;
+constexpr const char* kNoMemory = "no memory";
 
 // Of the bytes of a file, or of a text. Nothing: the file cannot be read.
 std::optional<std::string> digestOf(std::string_view bytes, const FileDescriptor* file,
@@ -51,9 +52,15 @@ void putDigest(HistoryRecord& record) {
   header.setIfPresent("sha256", digestOf(record.body, record.file.get(), record.bodyBytes));
   header.set("kept", false);
   record.header = formats::writeJSON(header);
-  record.body.clear();
+  std::string().swap(record.body);  // it may have to wait for the disk
   record.file.reset();
   record.digestAlone = false;
+}
+
+std::size_t waitingBytes(const HistoryRecords& records) {
+  std::size_t bytes = 0;
+  for (const HistoryRecord& record : records) bytes += record.waitingBytes();
+  return bytes;
 }
 
 std::string idOf(std::uint64_t number) {
@@ -147,31 +154,34 @@ void History::writeSoon() {
 
 void History::write() {
   _asked = false;
-  std::vector<HistoryRecord> records;
+  HistoryRecords records;
   HistorySpace space;
   {
     const Lock held(_mutex);
     records.swap(_waiting);
     space = _space;
   }
-  std::size_t bytes = 0;
-  for (const HistoryRecord& record : records) bytes += record.waitingBytes();
-  for (HistoryRecord& record : records) {
-    if (record.digestAlone) putDigest(record);
-  }
-  const std::int64_t today = _clock.now().seconds / kDaySeconds;
+  const std::size_t before = waitingBytes(records);
   std::string error;
-  const std::size_t written = _folder.append(records, error);
-  for (std::size_t i = written; i < records.size(); ++i) bytes -= records[i].waitingBytes();
+  try {
+    for (HistoryRecord& record : records) {
+      if (record.digestAlone) putDigest(record);
+    }
+    _folder.append(records, error);
+  } catch (const std::bad_alloc&) {
+    error = kNoMemory;
+  }
+  {
+    const Lock held(_mutex);
+    _waitingBytes.fetch_sub(before - waitingBytes(records), std::memory_order_relaxed);
+    _waiting.splice(_waiting.begin(), records);
+  }
   if (!error.empty() && !_failed)
     logError("The history of what left could not be written, and nothing more leaves: %s", error.c_str());
   _failed = !error.empty();
+  const std::int64_t today = _clock.now().seconds / kDaySeconds;
   if (keeps()) _folder.trim(space, today);
   const Lock held(_mutex);
-  _waiting.insert(_waiting.begin(),
-                  std::make_move_iterator(records.begin() + static_cast<std::ptrdiff_t>(written)),
-                  std::make_move_iterator(records.end()));
-  _waitingBytes.fetch_sub(bytes, std::memory_order_relaxed);
   _trimmedOn = today;
 }
 
@@ -189,13 +199,18 @@ bool History::writeNow(std::chrono::steady_clock::time_point deadline) {
 }
 
 std::optional<HistoryFolder::Removed> History::purge(std::chrono::steady_clock::time_point deadline) {
-  const auto done = std::make_shared<std::promise<HistoryFolder::Removed>>();
+  const auto done = std::make_shared<std::promise<std::optional<HistoryFolder::Removed>>>();
   auto removed = done->get_future();
   using Put = platform::DiskWriter::Queue::Put;
   const auto put = _queue.put(
       [this, done] {
-        write();
-        done->set_value(_folder.purge());
+        std::optional<HistoryFolder::Removed> all;
+        try {
+          write();
+          all = _folder.purge();
+        } catch (const std::bad_alloc&) {
+        }
+        done->set_value(all);
       },
       1);
   if (put != Put::taken || removed.wait_until(deadline) != std::future_status::ready) return std::nullopt;

@@ -10,7 +10,6 @@
 #include <string>
 #include <string_view>
 #include <utility>
-#include <vector>
 
 #include "base/file_descriptor.h"
 #include "base/mutex.h"
@@ -63,7 +62,7 @@ class History {
   void writeSoon();
   // Waits until what was recorded before is on disk. False if `deadline` passed first.
   bool writeNow(std::chrono::steady_clock::time_point deadline);
-  // Removes all of it. Nothing if the disk writer cannot do it by the deadline.
+  // Removes all of it. Nothing if the disk writer cannot do it by the deadline, or has no memory for it.
   std::optional<HistoryFolder::Removed> purge(std::chrono::steady_clock::time_point deadline);
   const std::string& directory() const { return _directory; }
 
@@ -84,7 +83,7 @@ class History {
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   HistorySpace _space GUARDED_BY(_mutex);
-  std::vector<HistoryRecord> _waiting GUARDED_BY(_mutex);
+  HistoryRecords _waiting GUARDED_BY(_mutex);
   std::uint64_t _lastNumber GUARDED_BY(_mutex) = 0;
   std::int64_t _trimmedOn GUARDED_BY(_mutex) = 0;
 

@@ -14,6 +14,7 @@
 #include <cstdio>
 #include <cstring>
 #include <ctime>
+#include <new>
 #include <numeric>
 
 #include "platform/file_store.h"
@@ -30,8 +31,12 @@ constexpr std::size_t kCopyPiece = 256u << 10;
 // Written in one call, if bodies are small.
 constexpr std::size_t kMostInOneWrite = 1u << 20;
 
+std::string textOf(int error) {
+  return std::strerror(error);
+}
+
 std::string textOfErrno() {
-  return std::strerror(errno);
+  return textOf(errno);
 }
 
 void syncDirectory(const std::string& path) {
@@ -90,6 +95,19 @@ class Appending {
   std::string _bytes;
 };
 
+// Returns an errno, 0 if all of it is on disk.
+int writeAndSync(int file, HistoryRecords::const_iterator first, HistoryRecords::const_iterator last) {
+  try {
+    Appending appending(file);
+    const bool written =
+        std::all_of(first, last, [&](const auto& record) { return appending.write(record); }) &&
+        appending.flush() && ::fdatasync(file) == 0;
+    return written ? 0 : errno;
+  } catch (const std::bad_alloc&) {
+    return ENOMEM;
+  }
+}
+
 }  // namespace
 
 std::string HistoryFolder::nameOf(std::int64_t day) {
@@ -143,22 +161,21 @@ std::uint64_t HistoryFolder::mend() {
   return cut;
 }
 
-std::size_t HistoryFolder::append(const std::vector<HistoryRecord>& records, std::string& error) {
-  const HistoryRecord* const end = records.data() + records.size();
-  const HistoryRecord* first = records.data();
-  while (first != end) {
-    const auto* last = std::find_if(first, end, [first](const auto& one) { return one.day != first->day; });
-    if (auto written = appendTo(first->day, first, last); !written) {
+void HistoryFolder::append(HistoryRecords& records, std::string& error) {
+  while (!records.empty()) {
+    const std::int64_t day = records.front().day;
+    const auto last =
+        std::find_if(records.begin(), records.end(), [day](const auto& one) { return one.day != day; });
+    if (auto written = appendTo(day, records.begin(), last); !written) {
       error = std::move(written.error());
-      break;
+      return;
     }
-    first = last;
+    records.erase(records.begin(), last);
   }
-  return static_cast<std::size_t>(first - records.data());
 }
 
-Result<Done, std::string> HistoryFolder::appendTo(std::int64_t day, const HistoryRecord* first,
-                                                  const HistoryRecord* last) {
+Result<Done, std::string> HistoryFolder::appendTo(std::int64_t day, HistoryRecords::const_iterator first,
+                                                  HistoryRecords::const_iterator last) {
   if (const auto made = platform::makeDirectories(_directory, 0700); !made)
     return Failure{made.error().description};
   const std::string path = pathOf(_directory, day);
@@ -166,13 +183,11 @@ Result<Done, std::string> HistoryFolder::appendTo(std::int64_t day, const Histor
   const FileDescriptor file(::open(path.c_str(), flags, 0600));
   struct stat before {};
   if (!file.isOpen() || ::fstat(file.get(), &before) != 0) return Failure{path + ": " + textOfErrno()};
-  Appending appending(file.get());
-  const bool written =
-      std::all_of(first, last, [&](const auto& record) { return appending.write(record); }) &&
-      appending.flush() && ::fdatasync(file.get()) == 0;
-  if (!written) {
-    std::string why = path + ": " + textOfErrno();
-    if (::ftruncate(file.get(), before.st_size) != 0) why += ", nor shortened: " + textOfErrno();
+  const int error = writeAndSync(file.get(), first, last);
+  if (error != 0) {
+    const bool shortened = ::ftruncate(file.get(), before.st_size) == 0;
+    std::string why = path + ": " + textOf(error);
+    if (!shortened) why += ", nor shortened: " + textOfErrno();
     return Failure{std::move(why)};
   }
   if (before.st_size == 0) syncDirectory(_directory);

@@ -4,11 +4,11 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <list>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include "base/file_descriptor.h"
 #include "base/result.h"
@@ -27,6 +27,9 @@ struct HistoryRecord {
 
   std::size_t waitingBytes() const { return sizeof *this + header.size() + body.size(); }
 };
+
+// A list, so that putting those back that could not be written needs no memory.
+using HistoryRecords = std::list<HistoryRecord>;
 
 // What the owner of the device allows it to take.
 struct HistorySpace {
@@ -53,15 +56,16 @@ class HistoryFolder {
 
   // Cuts off what a killed daemon has left unfinished. Returns how many bytes that were.
   std::uint64_t mend();
-  // Appends the records in order and syncs. Returns how many are on disk, whole; the others left no trace.
-  // The error is that of the first one that is not.
-  std::size_t append(const std::vector<HistoryRecord>& records, std::string& error);
+  // Appends the records in order, syncs, and removes those from the list that are on disk, whole; the others
+  // left no trace. The error is that of the first one that is not.
+  void append(HistoryRecords& records, std::string& error);
   // Removes the oldest records, until the rest is within the space.
   void trim(const HistorySpace& space, std::int64_t today);
   Removed purge();
 
  private:
-  Result<Done, std::string> appendTo(std::int64_t day, const HistoryRecord* first, const HistoryRecord* last);
+  Result<Done, std::string> appendTo(std::int64_t day, HistoryRecords::const_iterator first,
+                                     HistoryRecords::const_iterator last);
   void shorten(std::int64_t day, std::uint64_t bytes);
   void remove(std::int64_t day);
 

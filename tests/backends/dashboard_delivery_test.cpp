@@ -16,7 +16,7 @@ using namespace std::chrono_literals;
 using Verdict = backends::DeliverySchedule::Verdict;
 
 // A network that takes datagrams on some ticks only; the first transmission is tick 0. On others they may not
-// leave again.
+// leave.
 struct Network {
   explicit Network(std::set<int> closedAt, std::set<int> forbiddenAt = {})
       : closed(std::move(closedAt)), forbidden(std::move(forbiddenAt)) {}
@@ -27,9 +27,9 @@ struct Network {
   std::vector<std::string> sent;
 
   backends::MessageQueue::Send send() {
-    return [this](std::string_view datagram, bool first) {
+    return [this](std::string_view datagram, bool) {
       using Sending = backends::MessageQueue::Sending;
-      if (!first && forbidden.contains(now)) return Sending::forbidden;
+      if (forbidden.contains(now)) return Sending::forbidden;
       if (closed.contains(now)) return Sending::notTaken;
       sentAt.push_back(now);
       sent.emplace_back(datagram);
@@ -53,12 +53,16 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
                          {false, {}, {0}, 0},                       // sent is done
                          {false, {0, 1, 2}, {3}, 3},
                          {true, {}, {0, 2}, 5, {5}},
-                         {true, {0}, {1, 3}, 6, {1, 6}},  // one that was held is not forbidden
-                         {false, {0, 1}, {2}, 2, {2}}}) {
+                         {true, {}, {}, 0, {0}},
+                         {true, {0}, {1, 3}, 6, {6}},
+                         {true, {0}, {}, 1, {1}},  // one that was held has not left before
+                         {false, {0, 1}, {}, 2, {2}}}) {
     Network network(c.closed, c.forbidden);
     backends::MessageQueue queue(c.reliable, false, network.send());
     EXPECT_EQ(queue.tryToSendMsg("datagram", 1, platform::Charge()).fate,
-              c.closed.contains(0) ? wire::Reason::datagram_held : wire::Reason::datagram_sent);
+              c.forbidden.contains(0) ? wire::Reason::datagram_over_daily_limit
+              : c.closed.contains(0)  ? wire::Reason::datagram_held
+                                      : wire::Reason::datagram_sent);
     std::size_t givenUp = 0, forbidden = 0;
     while (!queue.empty() && network.now < 100) {
       ++network.now;
@@ -68,7 +72,7 @@ TEST(DashboardDelivery, ADatagramIsSentUntilItsRulesLetItGo) {
     }
     EXPECT_EQ(network.sentAt, c.sentAt);
     EXPECT_EQ(network.now, c.leavesAt);
-    EXPECT_EQ(forbidden, c.reliable && !c.forbidden.empty() ? 1u : 0u);
+    EXPECT_EQ(forbidden, c.forbidden.empty() || c.forbidden.contains(0) ? 0u : 1u);
     EXPECT_EQ(givenUp, c.reliable && c.forbidden.empty() ? 1u : 0u);
   }
 }

@@ -9,9 +9,11 @@
 #include <vector>
 
 #include "config/daily_allowance.h"
+#include "config/destinations.h"
 #include "config/field_rules.h"
 #include "config/owner_gate.h"
 #include "configuration.h"
+#include "fakes/scarce_memory.h"
 #include "formats/json.h"
 #include "platform/device_secret.h"
 
@@ -85,6 +87,24 @@ TEST(Policy, AShortageKeepsWhatHeldAndClosesBeforeTheFirstReading) {
   EXPECT_EQ(owner.policy.current()->refusal(true), policy_reporting);
 }
 
+TEST(Policy, IsReadAgainForWantOfMemoryAndNeverTakenForBroken) {
+  const std::pair<const char*, std::string> forms[] = {
+      {"/etc/veltrad/policy.json", R"({"reporting": "off", "remove": ["a long name of a field", "b"]})"},
+      {"/etc/veltrad/policy.plist", formats::writeXMLPropertyList(Dictionary{
+                                        {"reporting", "off"}, {"remove", Array{"a long name of a field"}}})}};
+  for (const auto& form : forms) {
+    forEachShortage([&](const auto& shortOfMemory) {
+      Owner owner;
+      EXPECT_EQ(owner.policy.current()->refusal(true), std::nullopt);
+      owner.files.put(form.first, form.second);
+      std::optional<wire::Reason> meanwhile;
+      shortOfMemory([&] { meanwhile = owner.policy.current()->refusal(true); });
+      EXPECT_NE(meanwhile, policy_broken);
+      EXPECT_EQ(owner.policy.current()->refusal(true), policy_reporting) << form.first;
+    });
+  }
+}
+
 TEST(Policy, MakesTheBackendsAndReachesTheHostsThatItNames) {
   Owner owner;
   EXPECT_TRUE(owner.says("{}").makes("httppost"));
@@ -136,6 +156,9 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   EXPECT_FALSE(day.take(events, 1, 0));
   EXPECT_TRUE(day.take(events, 0, 10));
   EXPECT_FALSE(day.take(bytes, 0, 1));
+  day.giveBack(0, 5);
+  EXPECT_FALSE(day.take(bytes, 0, 6));
+  EXPECT_TRUE(day.take(bytes, 0, 5));
   files.put("/daily", day.text());
   config::DailyAllowance next(files, clock, "/daily");
   EXPECT_TRUE(next.take({}, 4, 10));
@@ -144,6 +167,7 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   EXPECT_TRUE(next.take(both, 2, 10));
   EXPECT_FALSE(next.take(both, 0, 1));
   clock.seconds += 86'400;
+  next.giveBack(1, 10);  // of the day before
   EXPECT_TRUE(next.take(both, 9, 120));
   for (const char* text : {"", "[]", R"({"day": "x"})", R"({"day": 19999, "events": 9})"}) {
     files.put("/daily", text);
@@ -151,6 +175,55 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
     fresh.load();
     EXPECT_TRUE(fresh.take(both, 9, 120)) << text;
   }
+}
+
+TEST(Destinations, FitAFrameAndTheirFileWhateverStorebagsName) {
+  FakeClock clock;
+  FakeFileStore files;
+  config::Destinations destinations(files, clock, "/destinations");
+  constexpr std::uint64_t kHours = 24, kServers = 300;
+  for (std::uint64_t hour = 0; hour < kHours; ++hour) {
+    if (hour > 0) clock.advance(3'600);
+    for (std::uint64_t i = 0; i < kServers; ++i) {
+      const std::string url = "https://" + std::to_string(hour * 1'000 + i) + std::string(5'000, '\1') + "/x";
+      destinations.count(http::Departure::Kind::post, url, 1, hour == 0 ? 2 : 1);
+    }
+  }
+  files.put("/destinations", destinations.text());
+  config::Destinations next(files, clock, "/destinations");
+  next.load();
+  const Array all = next.lastDay();
+  EXPECT_LT(writeBinaryPropertyList(all).size(), 1'000'000u);
+  std::int64_t events = 0;
+  std::size_t ofMost = 0;
+  for (const Value& one : all) {
+    events += one.asDictionary()->find("events")->toInt64().value();
+    ofMost += one.asDictionary()->find("bytes")->toInt64() == 2 ? 1u : 0u;
+  }
+  EXPECT_EQ(events, kHours * kServers);
+  EXPECT_EQ(ofMost, config::Destinations::kMost);
+}
+
+TEST(DropReceipt, FitsAFrameWhateverProgramsCallThemselves) {
+  using Kind = http::Departure::Kind;
+  config::DropReceipt receipt;
+  receipt.begin();
+  constexpr std::int64_t kClients = 5'000;
+  for (std::int64_t i = 0; i < kClients; ++i) {
+    std::string name;
+    for (int n = 0; n < 500; ++n) name += "é";
+    receipt.add(
+        Kind::post,
+        std::make_shared<const Dictionary>(Dictionary{{"sessionID", i}, {"client", name}, {"service", name}}),
+        2);
+  }
+  const Dictionary dropped = receipt.end();
+  EXPECT_LT(writeBinaryPropertyList(dropped).size(), 1'000'000u);
+  std::int64_t events = 0;
+  for (const Value& line : *dropped.array("byClient"))
+    events += line.asDictionary()->find("events")->toInt64().value();
+  EXPECT_EQ(events, 2 * kClients);
+  EXPECT_EQ(dropped.find("events")->toInt64(), events);
 }
 
 TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {

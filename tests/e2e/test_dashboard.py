@@ -81,6 +81,22 @@ class Dashboard(HTTPSTest):
             wait_until(lambda: b"StorebagVersion" in server.recv(4096), "the stop message")
         self.assertGreater(self.counts()["datagram held: the socket did not take it"], 10)
 
+    def test_what_the_socket_does_not_take_does_not_count_for_the_day(self):
+        """Each refused datagram fails the next send, whether that is a first one or, on a tick, another."""
+        self.report_to(port=closed_port(), reliable=PERIOD)
+        with self.serving():
+            client = self.client()
+            for number in range(60):  # some of them are dropped without having left
+                client.message(number=number)
+            wait_until(lambda: self.stats().get("datagram sent again: not acknowledged", 0) > 40, "retransmissions")
+            client.close()
+        counts = self.counts()
+        day = json.loads((self.root.path / "var/lib/veltrad/daily.json").read_text())
+        hours = json.loads((self.root.path / "var/lib/veltrad/destinations.json").read_text())
+        left = [sum(column) for column in zip(*(row for hour in hours.values() for row in hour.values()))]
+        self.assertEqual((day["events"], day["bytes"]), (left[1], left[4]))
+        self.assertEqual(day["events"], counts["datagram sent"])
+
     def test_both_reports_of_one_call(self):
         self.report_to(entry(), reliable=PERIOD)
         with self.serving():

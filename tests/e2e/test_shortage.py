@@ -5,9 +5,11 @@ import contextlib
 import os
 import resource
 import shutil
+import signal
 import subprocess
+import unittest
 
-from harness import DEADLINE, DEVICE, START, SystemTest, Wire, program, wait_until
+from harness import BUILD, DEADLINE, DEVICE, START, SystemTest, Wire, program, wait_until
 
 NOBODY = 65534
 
@@ -83,6 +85,25 @@ class Shortage(SystemTest):
                 subprocess.run(["prlimit", f"--pid={daemon.popen.pid}", f"--nproc={number}:"], check=True, **options)
                 self.assertEqual(client.call(START)["results"].get("backends"), backends)
             first.close(), second.close()
+
+    @unittest.skipIf(BUILD.name in ("asan", "tsan"), "a sanitizer has an allocator of its own")
+    def test_a_policy_for_which_there_is_no_memory(self):
+        """It is read by the main thread several times a second, and after SIGHUP. Nothing but it needs so much memory."""
+        with self.serving("There is no memory for what is done each second") as daemon:
+            pid, client = daemon.popen.pid, Wire(self.root)
+            client.describe()
+            self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
+            hard = resource.prlimit(pid, resource.RLIMIT_DATA)[1]
+            resource.prlimit(pid, resource.RLIMIT_DATA, (daemon.status("VmData") * 1024, hard))
+            self.root.write("etc/veltrad/policy.json", b'{"reporting": "off"} //' + b"x" * (12 << 20))
+            for _ in range(2):
+                daemon.wait_for_line("There is no memory for what is done each second")
+                daemon.popen.send_signal(signal.SIGHUP)
+                daemon.wait_for_line("main: SIGHUP, configuration is read again")
+            self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
+            resource.prlimit(pid, resource.RLIMIT_DATA, (hard, hard))
+            wait_until(lambda: not client.call(START)["results"].get("backends"), "the policy")
+            client.close()
 
     def test_entitlements_during_a_shortage(self):
         """However far a connection gets during the shortage, the next one finds the current rules."""

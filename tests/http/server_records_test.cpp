@@ -12,6 +12,8 @@ using http::ServerRecords;
 TEST(ServerRecords, ForgetThoseThatWereNotUsedForTheLongestTime) {
   ServerRecords records;
   const auto host = [](std::size_t number) { return std::to_string(1000 + number) + ".example:443"; };
+  records.ended(std::string(70'000, 'x'), false, 1);  // no such name can be resolved
+  EXPECT_LT(records.all().at(0).address.size(), 500u);
   for (std::size_t i = 0; i < ServerRecords::kMost; ++i) records.ended(host(i), i == 0, 5);
   records.ended(host(0), false, 6);
   EXPECT_EQ(records.all().size(), ServerRecords::kMost);

@@ -7,6 +7,7 @@
 
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
+#include "fakes/scarce_memory.h"
 #include "fakes/unix_socket.h"
 #include "formats/property_list.h"
 #include "ipc/peer.h"
@@ -136,6 +137,22 @@ TEST_F(EntitlementsTest, TheLastRulesStandDuringAShortage) {
   }
   _files.runShort(false);
   EXPECT_FALSE(granted());
+}
+
+TEST(Entitlements, AreReadAgainForWantOfMemory) {
+  const ipc::Peer peer{1'000, {100}, 42, {}};
+  const std::string mine = formats::writeXMLPropertyList(Array{rule({{"uid", 1'000}})});
+  const std::string anothers = formats::writeXMLPropertyList(Array{rule({{"uid", 1}}), rule({{"uid", 2}})});
+  forEachShortage([&](const auto& shortOfMemory) {
+    FakeFileStore files;
+    ipc::Entitlements entitlements(files, kPath);
+    files.put(kPath, mine);
+    shortOfMemory([&] { EXPECT_TRUE(entitlements.valueForEntitlement(kName, peer)); });
+    EXPECT_TRUE(entitlements.valueForEntitlement(kName, peer));
+    files.put(kPath, anothers);
+    shortOfMemory([&] { static_cast<void>(entitlements.valueForEntitlement(kName, peer)); });
+    EXPECT_FALSE(entitlements.valueForEntitlement(kName, peer));
+  });
 }
 
 TEST(SystemUnit, IsTheFirstBelowTheSlicesAndNeverAUsers) {

@@ -11,6 +11,7 @@
 
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
+#include "fakes/scarce_memory.h"
 #include "formats/json.h"
 #include "platform/child_process.h"
 #include "platform/counters.h"
@@ -69,6 +70,24 @@ TEST(DiskWriter, AThreadThatCannotBeStartedIsStartedByALaterJob) {
     writer.drain(soon());
   });
   EXPECT_EQ(child.said, "no thread\nwritten\n");
+}
+
+TEST(StateFile, IsWrittenLaterForWantOfMemory) {
+  std::uint64_t version = 0;
+  FakeFileStore files;
+  platform::DiskWriter writer;
+  platform::StateFile file({"The state", [&] { return platform::StateFile::Version{version}; },
+                            [&] { return std::to_string(version); }},
+                           files, writer, "/run/c");
+  for (version = 1; version <= 100; ++version) {
+    {
+      const ScarceMemory scarce(0, false);  // some of the requests need memory
+      file.writeSoon();
+    }
+    EXPECT_TRUE(file.writeSoon());
+    EXPECT_TRUE(writer.drain(soon()));
+    EXPECT_EQ(files.bytes("/run/c"), std::to_string(version));
+  }
 }
 
 TEST(StateFile, IsWrittenWhenTheStateChangedAndAgainAfterAFailure) {

@@ -7,6 +7,7 @@
 #include "base/property_list.h"
 #include "fakes/fake_file_store.h"
 #include "fakes/recorded_log.h"
+#include "fakes/scarce_memory.h"
 #include "platform/uuid.h"
 
 namespace veltrad::platform {
@@ -37,6 +38,19 @@ TEST_F(FilePreferencesTest, PutsAMalformedFileAsideWithOneLineAndGoesOn) {
     const auto made = _preferences.textOrStore(kDomain, "a", platform::randomUUIDText);
     EXPECT_EQ(_preferences.text(kDomain, "a"), made);
   }
+}
+
+TEST(FilePreferences, AFileForWhichThereIsNoMemoryIsNotPutAside) {
+  const std::string text =
+      R"(<plist version="1.0"><dict><key>consent</key><true/><key>id</key><string>a text</string></dict></plist>)";
+  forEachShortage([&](const auto& shortOfMemory) {
+    FakeFileStore files;
+    platform::FilePreferences preferences(files, "/preferences");
+    files.put(kPath, text);
+    shortOfMemory([&] { static_cast<void>(preferences.lookUp(kDomain, "consent")); });
+    EXPECT_EQ(preferences.value(kDomain, "consent"), Value(true));
+    EXPECT_EQ(files.bytes(kPath), text);
+  });
 }
 
 TEST_F(FilePreferencesTest, AFileThatCannotBeReadForTheMomentIsNotOverwritten) {

@@ -4,39 +4,8 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <new>
-
 #include "base/property_list.h"
-
-#ifndef __has_feature
-#define __has_feature(feature) 0  // GCC
-#endif
-
-// A sanitizer has operators of its own.
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-#define VELTRA_OWN_OPERATORS 0
-#else
-#define VELTRA_OWN_OPERATORS 1
-#endif
-
-#if VELTRA_OWN_OPERATORS
-namespace {
-thread_local bool thereIsNoMemory = false;
-}  // namespace
-
-void* operator new(std::size_t size) {
-  void* memory = thereIsNoMemory ? nullptr : std::malloc(size);
-  if (!memory) throw std::bad_alloc();
-  return memory;
-}
-void operator delete(void* memory) noexcept {
-  std::free(memory);
-}
-void operator delete(void* memory, std::size_t) noexcept {
-  std::free(memory);
-}
-#endif
+#include "fakes/scarce_memory.h"
 
 namespace veltrad {
 namespace {
@@ -70,21 +39,25 @@ TEST(WatchedContents, NothingIsKeptOnceNobodyWatches) {
   EXPECT_EQ(contents.next(), 3u);
 }
 
-#if VELTRA_OWN_OPERATORS
-TEST(WatchedContents, WithoutMemoryLosesWhatOneMessageHolds) {
-  WatchedContents contents;
-  const auto watch = contents.watch();
+TEST(WatchedContents, WithoutMemoryLosesWhatOneMessageHoldsAndNothingElse) {
   const Dictionary payload{{"text", std::string(100, 'x')}};
-  for (const std::uint64_t message : {1u, 2u, 3u}) {
-    thereIsNoMemory = message == 2;
-    contents.keep(message, &payload, &kUserInfo);
-    thereIsNoMemory = false;
-  }
-  const auto copy = contents.copy(0);
-  ASSERT_EQ(copy.pieces.size(), 2u);
-  EXPECT_EQ(copy.pieces[1].message, 3u);
+  forEachShortage([&](const auto& shortOfMemory) {
+    WatchedContents contents;
+    const auto watch = contents.watch();
+    contents.keep(1, &payload, &kUserInfo);
+    bool thrown = true;
+    shortOfMemory([&] {
+      contents.keep(2, &payload, &kUserInfo);
+      thrown = false;
+    });
+    EXPECT_FALSE(thrown);
+    contents.keep(3, &payload, &kUserInfo);
+    const auto copy = contents.copy(0);
+    ASSERT_GE(copy.pieces.size(), 2u);
+    EXPECT_EQ(copy.pieces[0].message, 1u);
+    EXPECT_EQ(copy.pieces.back().message, 3u);
+  });
 }
-#endif
 
 TEST(WatchedContents, TheOldestMakeRoomAndAnAnswerFitsAFrame) {
   for (const std::size_t length : {10u, 5'000u, 900'000u}) {

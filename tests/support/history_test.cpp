@@ -16,6 +16,7 @@
 
 #include "fakes/machine.h"
 #include "fakes/recorded_log.h"
+#include "fakes/scarce_memory.h"
 #include "fakes/temporary_directory.h"
 #include "support/history_file.h"
 
@@ -110,6 +111,38 @@ TEST_F(HistoryTest, KeepsTheNewestWithinItsBytesAndDays) {
   ASSERT_TRUE(removed);
   EXPECT_GT(removed->records, 10u);
   EXPECT_TRUE(HistoryFolder::days(_history->directory()).empty());
+}
+
+TEST_F(HistoryTest, LosesNothingForWantOfMemory) {
+  platform::DiskWriter::Queue another(_writer, 1);
+  const auto onWriter = [&](const std::function<void()>& job) {
+    another.put(job, 1);
+    _writer.drain(std::chrono::steady_clock::now() + 20s);
+  };
+  for (const bool once : {true, false}) {
+    bool failed = true;
+    for (std::size_t granted = 0; failed; ++granted) {
+      _space.bytes = 65'536;
+      restart();
+      onWriter([] {});                // the files are mended
+      add(std::string(17'000, 'x'));  // of which the digest is kept
+      add("small");
+      std::optional<ScarceMemory> scarce;
+      onWriter([&] { scarce.emplace(granted, once); });
+      write();
+      onWriter([&] {
+        failed = scarce->hasFailed();
+        scarce.reset();
+      });
+      add("next");
+      ASSERT_TRUE(write());
+      const auto all = records(today());
+      ASSERT_GE(all.size(), 3u);
+      for (std::size_t back = 0; back < 3; ++back)
+        ASSERT_EQ(all[all.size() - 1 - back].first, _count - static_cast<int>(back)) << granted;
+      EXPECT_TRUE(_history->hasRoom());
+    }
+  }
 }
 
 TEST_F(HistoryTest, ALargeBodyIsKeptAsItsDigest) {

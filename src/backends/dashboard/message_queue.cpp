@@ -30,7 +30,9 @@ MessageQueue::MessageQueue(bool reliableUDP, bool shared, Send send, Recorder re
 MessageQueue::First MessageQueue::tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                                                std::optional<platform::Charge> charge,
                                                const DatagramOwner& owner, std::uint64_t message) {
-  const bool sent = _send(datagram, true) == Sending::done;
+  const Sending sending = _send(datagram, true);
+  if (sending == Sending::forbidden) return {wire::Reason::datagram_over_daily_limit, std::nullopt, 0, false};
+  const bool sent = sending == Sending::done;
   const std::uint64_t record = sent ? recordSent(datagram, owner) : 0;
   First result{sent ? wire::Reason::datagram_sent : wire::Reason::datagram_held, std::nullopt, 0, false};
   const bool waits = !sent || _reliableUDP;
@@ -72,7 +74,13 @@ MessageQueue::Sending MessageQueue::send(const UDPPacketToSend& record) {
 
 bool MessageQueue::check(UDPPacketToSend& record, Tick& result) {
   if (record.state == UDPPacketToSend::awaitsAcknowledgement) return checkAcknowledgement(record, result);
-  if (send(record) == Sending::notTaken) return false;
+  const Sending sending = send(record);
+  if (sending == Sending::notTaken) return false;
+  if (sending == Sending::forbidden) {
+    ++result.forbidden;
+    _tell(record.message, wire::Step::dropped, wire::Reason::datagram_over_daily_limit);
+    return true;
+  }
   ++result.sent;
   _tell(record.message, wire::Step::sent, wire::Reason::datagram_sent);
   record.state = UDPPacketToSend::awaitsAcknowledgement;

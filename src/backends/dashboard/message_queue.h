@@ -27,7 +27,7 @@ class MessageQueue {
   static constexpr std::size_t maxPendingSharedPackets = 1024;
   // notTaken: not all bytes were sent. forbidden: by the owner's limit for the day.
   enum class Sending { done, notTaken, forbidden };
-  // `first`: it has never been sent. It was counted when it was taken in, so nothing forbids it.
+  // `first`: it has never been sent.
   using Send = std::function<Sending(std::string_view datagram, bool first)>;
   // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
   // or acknowledged.
@@ -39,8 +39,8 @@ class MessageQueue {
     std::function<void(std::uint64_t record, std::size_t bytes, int transmissions, const char* error)> ended;
   };
 
-  // The result of a first transmission: whether it was sent, held, or lost for lack of memory; and why the
-  // oldest datagram was dropped to make room, if it was.
+  // The result of a first transmission: whether it was sent, held, forbidden, or lost for lack of memory; and
+  // why the oldest datagram was dropped to make room, if it was.
   struct First {
     wire::Reason fate;
     std::optional<wire::Reason> pushedOut;

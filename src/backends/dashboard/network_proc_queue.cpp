@@ -5,6 +5,7 @@
 #include <endian.h>
 
 #include <cstring>
+#include <new>
 
 #include "backends/dashboard/dashboard_queues.h"
 #include "backends/dashboard/reporting_packet.h"
@@ -49,12 +50,8 @@ NetworkProcQueue::NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> 
       _socket(std::move(socket)),
       _messageQueue(
           kind.reliableUDP, kind.shared,
-          [this](std::string_view datagram, bool first) REQUIRES(_mutex) {
-            using Sending = MessageQueue::Sending;
-            if (_kind.gate && !_kind.gate->hasRoomForRecord()) return Sending::notTaken;
-            if (!first && !mayLeave(0, datagram.size())) return Sending::forbidden;
-            return _socket.send(datagram) ? Sending::done : Sending::notTaken;
-          },
+          [this](std::string_view datagram, bool first)
+              REQUIRES(_mutex) { return send(datagram, first ? 1 : 0); },
           recorder(),
           [this](std::uint64_t message, wire::Step step, wire::Reason reason) {
             note(message, step, reason);
@@ -83,11 +80,6 @@ wire::Decision NetworkProcQueue::tryToSendMsg(std::string_view datagram, std::ui
     _counters.count(wire::Reason::ended_before_sent);
     _kind.pen.write(wire::Step::dropped, wire::Reason::ended_before_sent, fate);
     return {wire::Fate::dropped, wire::Reason::ended_before_sent};
-  }
-  if (!mayLeave(1, datagram.size())) {
-    _counters.count(wire::Reason::datagram_over_daily_limit);
-    _kind.pen.write(wire::Step::dropped, wire::Reason::datagram_over_daily_limit, fate);
-    return {wire::Fate::dropped, wire::Reason::datagram_over_daily_limit};
   }
   const MessageQueue::First first =
       _messageQueue.tryToSendMsg(datagram, eventNumber, std::move(charge), owner, fate.message);
@@ -122,8 +114,15 @@ void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEnt
        *first.pushedOut);
 }
 
-bool NetworkProcQueue::mayLeave(std::uint64_t events, std::uint64_t bytes) const {
-  return _kind.gate == nullptr || _kind.gate->mayLeave(events, bytes);
+// Counts it for the owner's limits of a day if the socket takes it.
+MessageQueue::Sending NetworkProcQueue::send(std::string_view datagram, std::uint64_t events) {
+  using Sending = MessageQueue::Sending;
+  config::OwnerGate* const gate = _kind.gate;
+  if (gate && !gate->hasRoomForRecord()) return Sending::notTaken;
+  if (gate && !gate->mayLeave(events, datagram.size())) return Sending::forbidden;
+  if (_socket.send(datagram)) return Sending::done;
+  if (gate) gate->didNotLeave(events, datagram.size());
+  return Sending::notTaken;
 }
 
 MessageQueue::Recorder NetworkProcQueue::recorder() const {
@@ -214,15 +213,19 @@ void NetworkProcQueue::giveUp(wire::Reason reason) {
 
 void NetworkProcQueue::armTimer(DeliverySchedule::Time time) {
   const auto next = _schedule.next(time, !_messageQueue.empty());
-  _armed = next.has_value();
+  _armed = false;  // also if there is no memory for it: the next datagram arms it then
   if (next) _timer->arm(*next, [self = shared_from_this()] { self->timerFired(); });
+  _armed = next.has_value();
 }
 
 void NetworkProcQueue::timerFired() {
   const Lock held(_mutex);
   if (!_timer) return;
   const auto time = now();
-  if (_schedule.tickIsDue(time)) myPeriodicTask(time);
+  try {
+    if (_schedule.tickIsDue(time)) myPeriodicTask(time);
+  } catch (const std::bad_alloc&) {  // what there is no memory for is done at the next tick
+  }
   if (_schedule.lastResortIsDue(time)) cleanupSources();
   if (_timer) armTimer(time);
 }

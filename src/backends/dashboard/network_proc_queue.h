@@ -85,7 +85,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   bool processSocketRead() REQUIRES(_mutex);
   void cleanupSources() REQUIRES(_mutex);
   // `events`: 1 for the first transmission, 0 for further ones, of which each counts its bytes.
-  bool mayLeave(std::uint64_t events, std::uint64_t bytes) const;
+  MessageQueue::Sending send(std::string_view datagram, std::uint64_t events) REQUIRES(_mutex);
   MessageQueue::Recorder recorder() const;
   std::optional<platform::Charge> chargeFor(std::size_t datagram) const;
   // False if the user has no memory left for a socket that outlives its back ends.

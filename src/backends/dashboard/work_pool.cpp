@@ -4,6 +4,7 @@
 
 #include <asio/executor_work_guard.hpp>
 #include <asio/io_context.hpp>
+#include <new>
 #include <optional>
 #include <system_error>
 #include <thread>
@@ -34,8 +35,18 @@ struct WorkPool::Impl {
       context.reset();
     }
   }
+  // False if a handler had no memory; the others go on.
+  static bool runs(asio::io_context& running) {
+    try {
+      running.run();
+      return true;
+    } catch (const std::bad_alloc&) {
+      return false;
+    }
+  }
   void run(asio::io_context& running) {
-    running.run();
+    while (!runs(running)) {
+    }
     const Lock held(mutex);
     --alive;
     ended.notifyAll();

@@ -5,8 +5,10 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <csignal>
 #include <future>
+#include <new>
 #include <thread>
 
 #include "fakes/few_descriptors.h"
@@ -186,6 +188,38 @@ TEST_F(HTTPClientTest, AShortageOfDescriptorsPasses) {
     }
     EXPECT_TRUE(client.perform(post(healthy.url(), "1")).ok());
   }
+}
+
+// Has no memory for as many answers as the test says.
+struct ShortGate final : http::RequestGate {
+  using Refusal = std::optional<http::RequestRefusal>;
+  static void answer(std::atomic<int>& shortages) {
+    if (shortages > 0 && shortages-- > 0) throw std::bad_alloc();
+  }
+  Refusal refusal(bool, std::string_view) const override { return answer(refusals), std::nullopt; }
+  Refusal count(const http::Departure&) override { return answer(counts), std::nullopt; }
+  bool keepsRecords() const override { return true; }
+  bool hasRoomForRecord() const override { return true; }
+  std::uint64_t record(const http::Departure&, std::vector<std::string>, std::string_view,
+                       std::shared_ptr<const FileDescriptor>) override {
+    return answer(records), 1;
+  }
+  void refused(const http::Departure&) override {}
+  void ended(std::uint64_t, const http::DepartureEnd&) override {}
+
+  mutable std::atomic<int> refusals = 0;
+  std::atomic<int> counts = 0, records = 0;
+};
+
+TEST_F(HTTPClientTest, ARequestThatNoMemoryCanBeHadForEndsAndOthersGoOn) {
+  ShortGate gate;
+  http::CurlHTTPClient asking{{place.path("ca.pem"), &gate}};
+  for (std::atomic<int>* shortages : {&gate.refusals, &gate.counts, &gate.records}) {
+    *shortages = 1;
+    EXPECT_ERROR(asking.perform(post(healthy.url(), "1")), shortage, HasSubstr("memory"));
+    EXPECT_TRUE(asking.perform(post(healthy.url(), "1")).ok());
+  }
+  EXPECT_EQ(asking.underWay(), 0u);
 }
 
 TEST_F(HTTPClientTest, NothingIsSentToAServerThatIsNotTrusted) {

@@ -1,0 +1,113 @@
+// SPDX-License-Identifier: Apache-2.0
+// Attempts each step of a tick by itself.
+#include "daemon/housekeeping.h"
+
+#include <algorithm>
+#include <new>
+
+#include "daemon/daemon.h"
+#include "ipc/listener.h"
+#include "platform/log.h"
+#include "platform/scheduling.h"
+#include "platform/state_file.h"
+
+namespace veltrad::daemon {
+
+namespace {
+using namespace std::chrono_literals;
+
+// How often the counters are written and the watchdog is fed.
+constexpr std::chrono::milliseconds kTick = 1000ms;
+// How often the owner's word is read again in that time: a change and the end of what is under way, which
+// takes one more time, are done within a second.
+constexpr int kOwnerTicks = 3;
+// The last threads may still be ending.
+constexpr int kTicksToReturnMemory = 3;
+}  // namespace
+
+Housekeeping::Housekeeping(Services& services, Daemon& daemon, ipc::Listener& listener,
+                           const StateFiles& files)
+    : _services(services),
+      _daemon(daemon),
+      _listener(listener),
+      _files(files),
+      _watchdog(services.serviceManager.watchdogInterval()),
+      _second(std::min(_watchdog.value_or(kTick), kTick)) {}
+
+std::chrono::milliseconds Housekeeping::interval() const {
+  return _second / kOwnerTicks;
+}
+
+template <typename Step>
+bool Housekeeping::attempt(const Step& step) {
+  try {
+    step();
+    return true;
+  } catch (const std::bad_alloc&) {
+    _isShort = true;
+    return false;
+  }
+}
+
+void Housekeeping::tick() {
+  _isShort = false;
+  if (_readsAgain) readConfigurationAgain();
+  attempt([this] { _daemon.privacy().hearOwner(); });
+  attempt([this] { _services.history.writeSoon(); });
+  if (++_ownerTicks >= kOwnerTicks) {
+    _ownerTicks = 0;
+    onceASecond();
+  }
+  sayShortage();
+}
+
+void Housekeeping::onceASecond() {
+  attempt([this] { _daemon.follower().tick(); });
+  attempt([this] { _daemon.startSpool(); });
+  attempt([this] { _services.allowance.load(); });
+  attempt([this] { _services.destinations.load(); });
+  writeStateFiles();
+  attempt([this] { returnMemoryWhenIdle(); });
+  attempt([this] {
+    if (_watchdog && _services.http.passesEmptyTask(_second)) _services.serviceManager.feedWatchdog();
+  });
+}
+
+void Housekeeping::writeStateFiles() {
+  attempt([this] { _files.counters.writeSoon(); });
+  attempt([this] { _files.metrics.writeSoon(); });
+  attempt([this] {
+    if (_services.allowance.version() > 0) _files.allowance.writeSoon();
+  });
+  attempt([this] {
+    if (_services.destinations.version() > 0) _files.destinations.writeSoon();
+  });
+}
+
+void Housekeeping::returnMemoryWhenIdle() {
+  // A session's memory is freed by its connection's thread, which may take its time on a busy machine.
+  const bool idle = _daemon.agent().sessionCount() == 0 && _listener.connectionCount() == 0 &&
+                    _services.memory.used() == 0 && _services.http.underWay() == 0;
+  // Detects sessions that came and went between two ticks.
+  const std::uint64_t accepted = _daemon.agent().acceptedSessions();
+  if (!idle || accepted != _accepted) {
+    _accepted = accepted;
+    _returns = kTicksToReturnMemory;
+  } else if (_returns > 0) {
+    --_returns;
+    _daemon.backends().rest();
+    platform::returnFreeMemory();
+  }
+}
+
+void Housekeeping::readConfigurationAgain() {
+  _readsAgain = !attempt([this] { _daemon.readConfigurationAgain(); });
+}
+
+void Housekeeping::sayShortage() {
+  if (_isShort && !_wasShort)
+    logWarning("There is no memory for what is done each second, and it is tried again");
+  _wasShort = _isShort;
+}
+
+}  // namespace veltrad::daemon
