@@ -15,7 +15,7 @@ namespace key = wire::key;
 
 namespace {
 
-std::string quoted(std::string_view text) {
+std::string jsonString(std::string_view text) {
   return formats::writeJSON(Value(text));
 }
 
@@ -26,8 +26,8 @@ std::string orNull(const std::optional<T>& value) {
 
 std::string formatError(const std::optional<wire::ReportingError>& error) {
   if (!error) return "null";
-  return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", quoted(error->domain), error->code,
-                     quoted(error->description));
+  return fmt::format(R"({{"domain":{},"code":{},"description":{}}})", jsonString(error->domain), error->code,
+                     jsonString(error->description));
 }
 
 template <typename Use>
@@ -109,7 +109,7 @@ std::string formatAggregated(const AggregatedCopy& copy) {
 }
 
 std::string formatMalformedLine(std::uint64_t line, std::string_view description) {
-  return fmt::format(R"({{"op":"error","line":{},"description":{}}})", line, quoted(description));
+  return fmt::format(R"({{"op":"error","line":{},"description":{}}})", line, jsonString(description));
 }
 
 }  // namespace veltrad::ctl

@@ -26,7 +26,7 @@ constexpr std::uint64_t kMostBody = std::uint64_t{1} << 40;
 constexpr std::uint64_t kMostInMemory = 512u << 20;
 // Seconds.
 constexpr std::int64_t kForgottenAfter = 86'400;
-constexpr std::int64_t kNanoseconds = 1'000'000'000;
+constexpr std::int64_t kPerSecond = 1'000'000'000;  // nanoseconds
 constexpr std::size_t kDayLength = 10;
 
 struct PiecePlace {
@@ -66,7 +66,7 @@ void PieceStore::forgetUnfinished(std::int64_t read) {
   for (const auto& entry : fs::directory_iterator(fs::path(_folder) / "incoming", error)) {
     struct stat found {};
     if (::stat(entry.path().c_str(), &found) == 0 &&
-        found.st_mtim.tv_sec < read / kNanoseconds - kForgottenAfter)
+        found.st_mtim.tv_sec < read / kPerSecond - kForgottenAfter)
       ::unlink(entry.path().c_str());
   }
 }
@@ -99,7 +99,7 @@ Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_v
     at += static_cast<std::uint64_t>(count);
     bytes.remove_prefix(static_cast<std::size_t>(count));
   }
-  const timespec times[] = {{0, UTIME_OMIT}, {time / kNanoseconds, time % kNanoseconds}};
+  const timespec times[] = {{0, UTIME_OMIT}, {time / kPerSecond, time % kPerSecond}};
   if (::futimens(file.get(), times) != 0) return failureOfFile(path);
   return Done();
 }
