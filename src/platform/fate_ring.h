@@ -22,7 +22,7 @@ namespace veltrad::platform {
 // Entries stand in the order in which they were written; the oldest are overwritten. A position counts
 // entries from 1 and is never used again. An entry refers to others, such as texts, only if they are at most
 // refresh() older, so that it knows them as long as it stands, but for the oldest few entries of the ring.
-class FateRing {
+class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its counters have a cache line alone
  public:
   static constexpr std::size_t kDefaultBytes = 512u << 10;
   static constexpr std::size_t kLeastBytes = 64u << 10;
