@@ -94,7 +94,7 @@ class Shortage(SystemTest):
             client.describe()
             self.assertEqual(client.call(START)["results"]["backends"], ["httppost"])
             hard = resource.prlimit(pid, resource.RLIMIT_DATA)[1]
-            resource.prlimit(pid, resource.RLIMIT_DATA, (daemon.status("VmData") * 1024, hard))
+            resource.prlimit(pid, resource.RLIMIT_DATA, (daemon.status("VmData") * 1024 + (4 << 20), hard))
             self.root.write("etc/veltrad/policy.json", b'{"reporting": "off"} //' + b"x" * (12 << 20))
             for _ in range(2):
                 daemon.wait_for_line("There is no memory for what is done each second")
