@@ -257,7 +257,10 @@ bool Listener::startClient(std::uint64_t number, unsigned uid,
                                   [this, number, connection] { runConnection(number, *connection); });
   } catch (const std::bad_alloc&) {  // as without a thread
   }
-  if (!started) forget(number, uid);
+  if (!started) {
+    _clients.erase(number);
+    forgetUser(uid);
+  }
   return started;
 }
 
@@ -267,16 +270,30 @@ std::size_t Listener::connectionCount() {
 }
 
 void Listener::reap() {
-  std::vector<Thread> finished;
+  std::map<std::uint64_t, Client> finished;
   {
     Lock lock(_mutex);
     finished.swap(_finished);
   }
-  for (Thread& thread : finished) thread.join();
+  for (auto& [number, client] : finished) client.thread.join();
 }
 
 // The connection's own thread, from here on.
 void Listener::runConnection(std::uint64_t number, SocketConnection& connection) {
+  try {
+    serve(connection);
+  } catch (const std::bad_alloc&) {  // it ends with the connection
+    _options.counters.count(wire::Reason::call_out_of_memory);
+  }
+  Lock lock(_mutex);
+  // A node moves without memory.
+  _finished.insert(_clients.extract(number)).position->second.connection.reset();
+  forgetUser(connection.peer().uid);
+  _changed.notifyAll();
+  wake();
+}
+
+void Listener::serve(SocketConnection& connection) {
   if (_delegate.listener(*this, connection.shared_from_this())) {
     connection.run();
   } else {
@@ -284,17 +301,11 @@ void Listener::runConnection(std::uint64_t number, SocketConnection& connection)
     connection.refuse(
         refusedPeer(connection.peer(), connection.peer().unit.value_or("none"), _options.entitlementsPath));
   }
-  Lock lock(_mutex);
-  _finished.push_back(std::move(_clients[number].thread));
-  forget(number, connection.peer().uid);
-  _changed.notifyAll();
-  wake();
 }
 
-void Listener::forget(std::uint64_t number, unsigned uid) {
+void Listener::forgetUser(unsigned uid) {
   const auto count = _clientsOfUser.find(uid);
   if (--count->second == 0) _clientsOfUser.erase(count);
-  _clients.erase(number);
 }
 
 }  // namespace veltrad::ipc

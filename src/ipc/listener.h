@@ -92,7 +92,8 @@ class Listener {
   void reap();
   void wake();
   void runConnection(std::uint64_t number, SocketConnection& connection);
-  void forget(std::uint64_t number, unsigned uid) REQUIRES(_mutex);
+  void serve(SocketConnection& connection);
+  void forgetUser(unsigned uid) REQUIRES(_mutex);
 
   // Constant after construction, except for the socket, which is closed when the accepting thread has ended.
   ListenerOptions _options;
@@ -111,8 +112,9 @@ class Listener {
   Condition _changed;
   bool _stopping GUARDED_BY(_mutex) = false;
   std::map<std::uint64_t, Client> _clients GUARDED_BY(_mutex);
+  // Those whose thread is to be joined.
+  std::map<std::uint64_t, Client> _finished GUARDED_BY(_mutex);
   std::map<unsigned, std::size_t> _clientsOfUser GUARDED_BY(_mutex);
-  std::vector<Thread> _finished GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::ipc

@@ -31,12 +31,12 @@ constexpr std::size_t kCopyPiece = 256u << 10;
 // Written in one call, if bodies are small.
 constexpr std::size_t kMostInOneWrite = 1u << 20;
 
-std::string textOf(int error) {
+std::string errorText(int error) {
   return std::strerror(error);
 }
 
 std::string textOfErrno() {
-  return textOf(errno);
+  return errorText(errno);
 }
 
 void syncDirectory(const std::string& path) {
@@ -186,7 +186,7 @@ Result<Done, std::string> HistoryFolder::appendTo(std::int64_t day, HistoryRecor
   const int error = writeAndSync(file.get(), first, last);
   if (error != 0) {
     const bool shortened = ::ftruncate(file.get(), before.st_size) == 0;
-    std::string why = path + ": " + textOf(error);
+    std::string why = path + ": " + errorText(error);
     if (!shortened) why += ", nor shortened: " + textOfErrno();
     return Failure{std::move(why)};
   }

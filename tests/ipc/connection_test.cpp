@@ -226,6 +226,18 @@ TEST(Stop, WaitsForACallNoLongerThanItsDeadlineAndRunsNoOtherAfterIt) {
   EXPECT_THAT(door.journal.lines(), ElementsAre("sendMessage 1 1 none", "invalidated", "end"));
 }
 
+// A place is free as soon as the thread has ended; until then the refusal is right.
+wire::FrameKind answerOnceThereIsRoom(Door& door) {
+  const auto deadline = within(kPatience);
+  wire::FrameKind answer{};
+  while (answer != wire::FrameKind::hello && std::chrono::steady_clock::now() < deadline) {
+    WireEnd again = door.stranger();
+    again.send(helloFrame());
+    answer = again.next().kind;
+  }
+  return answer;
+}
+
 TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
   Door door(3, 2);
   WireEnd first = door.client();
@@ -236,18 +248,19 @@ TEST(Listener, RefusesConnectionsBeyondItsBoundsAndNamesThem) {
   EXPECT_EQ(door.counters.value(wire::Reason::too_many_of_user), 1u);
   first.close();
   ASSERT_TRUE(door.journal.waitFor("end"));
-  // The place is free as soon as the thread has ended; until then the refusal is right.
-  const auto deadline = within(kPatience);
-  for (wire::FrameKind answer{}; answer != wire::FrameKind::hello;) {
-    ASSERT_LT(std::chrono::steady_clock::now(), deadline);
-    WireEnd again = door.stranger();
-    again.send(helloFrame());
-    answer = again.next().kind;
-  }
+  EXPECT_EQ(answerOnceThereIsRoom(door), wire::FrameKind::hello);
   Door narrow(1, 2);
   WireEnd only = narrow.client();
   WireEnd other = narrow.stranger();
   EXPECT_EQ(refusalOf(other), "Connection refused: 1 connections are open, and no more are taken.");
+}
+
+TEST(Listener, EndsAConnectionThatFindsNoMemoryAndTakesTheNext) {
+  Door door(1, 1);
+  door.refusesMemory = true;
+  EXPECT_TRUE(door.stranger().atEnd());
+  EXPECT_EQ(door.counters.value(wire::Reason::call_out_of_memory), 1u);
+  EXPECT_EQ(answerOnceThereIsRoom(door), wire::FrameKind::hello);
 }
 
 TEST(Listener, BoundsWhatUnfinishedFramesHoldTogether) {

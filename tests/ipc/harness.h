@@ -4,6 +4,9 @@
 
 #include <gmock/gmock.h>
 
+#include <atomic>
+#include <new>
+
 #include "base/property_list.h"
 #include "fakes/answering_session.h"
 #include "fakes/fake_file_store.h"
@@ -71,6 +74,7 @@ class Door : public ipc::ListenerDelegate {
   }
 
   bool listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) override {
+    if (refusesMemory.exchange(false)) throw std::bad_alloc();
     connection->setExportedObject(std::make_shared<RecordingSession>(journal, onMessage));
     connection->setInterruptionHandler([this] { journal.add("interrupted"); });
     connection->setInvalidationHandler([this] { journal.add("invalidated"); });
@@ -93,7 +97,8 @@ class Door : public ipc::ListenerDelegate {
   platform::Counters counters;
   platform::MemoryBudget memory;
   Journal journal;
-  RecordingSession::OnMessage onMessage;  // given to each session made afterwards
+  std::atomic<bool> refusesMemory{false};  // to the next connection
+  RecordingSession::OnMessage onMessage;   // given to each session made afterwards
 
  private:
   FakeFileStore _files;
