@@ -44,6 +44,15 @@ std::string_view wordAfter(std::string_view text, std::string_view mark) {
   return text.substr(0, text.find_first_of(" \t\n"));
 }
 
+// A mount in no list that can be read is usual below a chroot. Programs and other machines serve files
+// without a device, but for those of a disk that root has mounted by FUSE.
+FileOrigin unlisted(int descriptor) {
+  struct statx facts {};
+  if (::statx(descriptor, "", AT_EMPTY_PATH | AT_STATX_DONT_SYNC, STATX_TYPE, &facts) != 0) return {};
+  if (facts.stx_dev_major == 0) return {};
+  return {FileOrigin::Kind::local, "of a device"};
+}
+
 }  // namespace
 
 FileOrigin::Kind kindOfFileSystem(std::string_view type) {
@@ -71,10 +80,10 @@ FileOrigin FileOrigin::of(int descriptor, pid_t lender) {
   if (const auto type = typeOfMount(contentOf("/proc/self/mountinfo"), mount)) {
     return {kindOfFileSystem(*type), *type};
   }
-  if (lender <= 0) return {};
+  if (lender <= 0) return unlisted(descriptor);
   // Mount numbers are unique in the kernel, so it does no harm if another process has this number by now.
   const auto type = typeOfMount(contentOf(filled("/proc/{}/mountinfo", lender)), mount);
-  if (!type) return {};
+  if (!type) return unlisted(descriptor);
   const Kind kind = kindOfFileSystem(*type);
   return {kind == Kind::local ? Kind::local : Kind::foreign, *type};
 }

@@ -15,7 +15,7 @@ struct FileOrigin {
   // (overlay). foreign: a program or another machine serves it, or this is unknown.
   enum class Kind { local, stacked, foreign };
   Kind kind = Kind::foreign;
-  // As in /proc/self/mountinfo: "ext4", "fuse.sshfs".
+  // As in /proc/self/mountinfo: "ext4", "fuse.sshfs"; "of a device": a disk's, of a type that is unknown.
   std::string fileSystem = "unknown";
 
   // `lender` is the process that opened the file. A stacked file system of its own mount namespace counts as

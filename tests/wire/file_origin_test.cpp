@@ -5,7 +5,10 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mman.h>
+#include <sys/mount.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include "base/file_descriptor.h"
@@ -43,6 +46,19 @@ TEST(FileOrigin, OfDescriptors) {
   EXPECT_EQ(wire::FileOrigin::of(socket.get(), ::getpid()).kind, wire::FileOrigin::Kind::foreign);
   EXPECT_TRUE(wire::isNoRegularFile(directory.get()) && wire::isNoRegularFile(socket.get()));
   EXPECT_FALSE(wire::isNoRegularFile(memory.get()) || wire::isNoRegularFile(process.get()));
+}
+
+TEST(FileOrigin, OfAMountThatNoListHasAsBelowAChroot) {
+  for (const char* path : {"/proc/self/exe", "/dev/shm"}) {
+    const FileDescriptor mounted(::open_tree(AT_FDCWD, path, OPEN_TREE_CLONE | OPEN_TREE_CLOEXEC));
+    if (!mounted.isOpen()) GTEST_SKIP() << "only root may clone a mount";
+    struct stat facts {};
+    ASSERT_EQ(::fstat(mounted.get(), &facts), 0);
+    const auto expected =
+        major(facts.st_dev) == 0 ? wire::FileOrigin::Kind::foreign : wire::FileOrigin::Kind::local;
+    EXPECT_EQ(wire::FileOrigin::of(mounted.get(), 0).kind, expected) << path;
+    EXPECT_EQ(wire::FileOrigin::of(mounted.get(), ::getpid()).kind, expected) << path;
+  }
 }
 
 }  // namespace
