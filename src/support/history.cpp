@@ -191,7 +191,10 @@ bool History::writeNow(std::chrono::steady_clock::time_point deadline) {
   using Put = platform::DiskWriter::Queue::Put;
   const auto put = _queue.put(
       [this, done] {
-        write();
+        try {
+          write();
+        } catch (const std::bad_alloc&) {  // what it left waits for the next time, and nobody for this one
+        }
         done->set_value();
       },
       1);
