@@ -60,7 +60,8 @@ class History {
   // Queues a write if something waits, and once a day one that removes what is too old. To be called several
   // times a second.
   void writeSoon();
-  // Waits until the writer has tried to put on disk what was recorded before. False if `deadline` passed first.
+  // Waits until the writer has tried to put on disk what was recorded before. False if `deadline` passed
+  // first.
   bool writeNow(std::chrono::steady_clock::time_point deadline);
   // Removes all of it. Nothing if the disk writer cannot do it by the deadline, or has no memory for it.
   std::optional<HistoryFolder::Removed> purge(std::chrono::steady_clock::time_point deadline);
