@@ -3,7 +3,7 @@
 #include <expat.h>
 
 #include <memory>
-#include <optional>
+#include <utility>
 
 #include "formats/places.h"
 
@@ -21,7 +21,7 @@ class PlacesOfXML {
         _parser.get(), [](void* self, const XML_Char* name, const XML_Char**) { from(self).begin(name); },
         [](void* self, const XML_Char* name) { from(self).end(name); });
     XML_SetCharacterDataHandler(_parser.get(), [](void* self, const XML_Char* text, int length) {
-      if (from(self)._isKey) from(self)._key.append(text, static_cast<std::size_t>(length));
+      if (from(self)._isKey) from(self)._open.back().key.append(text, static_cast<std::size_t>(length));
     });
     XML_Parse(_parser.get(), bytes.data(), static_cast<int>(bytes.size()), XML_TRUE);
     return std::move(_top);
@@ -31,6 +31,9 @@ class PlacesOfXML {
   struct Open {
     bool isDictionary;
     Places places;
+    // Of a dictionary the key that was read last.
+    std::string key;
+    TextPlace keyPlace;
   };
 
   static PlacesOfXML& from(void* self) { return *static_cast<PlacesOfXML*>(self); }
@@ -43,48 +46,31 @@ class PlacesOfXML {
     if (name == "plist") return;
     _isKey = name == "key";
     if (_isKey) {
-      _key.clear();
-      _keyPlace = here();
-      return;
+      _open.back().keyPlace = here();
+    } else {
+      _open.push_back({name == "dict", {here(), {}, {}}, {}, {}});
     }
-    _open.push_back({name == "dict", {here(), {}, {}}});
-    if (!_open.back().isDictionary) return;
-    _keys.push_back({});
   }
 
   void end(std::string_view name) {
-    if (name == "plist") return;
-    if (name == "key") {
-      _isKey = false;
-      _keys.back() = {std::move(_key), _keyPlace};
-      _key.clear();
-      return;
-    }
+    _isKey = false;
+    if (name == "plist" || name == "key") return;
     Places done = std::move(_open.back().places);
-    if (_open.back().isDictionary) _keys.pop_back();
     _open.pop_back();
     if (_open.empty()) {
       _top = std::move(done);
     } else if (_open.back().isDictionary) {
-      _open.back().places.members.push_back({_keys.back().text, _keys.back().place, std::move(done)});
+      Open& open = _open.back();
+      open.places.members.push_back({std::exchange(open.key, {}), open.keyPlace, std::move(done)});
     } else {
       _open.back().places.elements.push_back(std::move(done));
     }
   }
 
-  struct KeyOfMember {
-    std::string text;
-    TextPlace place;
-  };
-
   const std::unique_ptr<std::remove_pointer_t<XML_Parser>, void (*)(XML_Parser)> _parser{
       XML_ParserCreate(nullptr), XML_ParserFree};
   bool _isKey = false;
-  std::string _key;
-  TextPlace _keyPlace;
   std::vector<Open> _open;
-  // Of each open dictionary the key that was read last.
-  std::vector<KeyOfMember> _keys;
   Places _top;
 };
 
