@@ -3,7 +3,6 @@
 #include "config/daily_allowance.h"
 
 #include <algorithm>
-#include <utility>
 
 #include "formats/json.h"
 #include "platform/clock.h"

@@ -4,8 +4,7 @@
 
 #include <fmt/format.h>
 
-#include <utility>
-
+#include "config/choice_row.h"
 #include "config/settings_check.h"
 
 namespace veltrad::config {
@@ -14,117 +13,81 @@ namespace {
 using enum KeyType;
 using enum Need;
 
-template <auto Member>
-constexpr Key chosen(const char* name, const char* choices, const char* byDefault, const char* meaning) {
-  Key key = row<Member>({name, choice, kUnbounded, optional, byDefault, meaning}).key;
-  key.choices = choices;
-  return key;
-}
-
-constexpr double kMostBytes = 1e15;
+constexpr Range kRingBytes{64 << 10, 256 << 20};
+constexpr Range kSpoolBytes{1 << 20, 1e15};
+constexpr Range kPace{0.001, 1'000};
+constexpr Range kShare{0, 1};
 constexpr Range kWait{0.05, 86'400};
 
-constexpr std::array kStorebagChoiceKeys{
+constexpr auto kStorebagChoiceKeys = keysOf<StorebagChoices>({
     row<&StorebagChoices::persist>(
         {"persist", boolean, kUnbounded, optional, "false",
-         "Keeps the last good storebag of each name on disk and verifies it again after a restart."})
-        .key,
-    chosen<&StorebagChoices::rollback>(
+         "Keeps the last good storebag of each name on disk and verifies it again after a restart."}),
+    choiceRow<&StorebagChoices::rollback>(
         "rollback", "refuse", "a lower \"serial\" is taken",
         "Refuses a storebag whose \"serial\" is lower than the highest seen for its name, or missing."),
-    chosen<&StorebagChoices::expiry>("expiry", "honour", "\"expires\" is not looked at",
-                                     "Refuses a storebag past its \"expires\" date and stops using one."),
-    chosen<&StorebagChoices::names>("names", "check", "\"name\" is not looked at",
-                                    "Refuses a storebag whose \"name\" is not the one asked for."),
-    chosen<&StorebagChoices::ed25519>("signature", "ed25519", "the RSA signature suffices",
-                                      "Asks for a good Ed25519 signature by one of \"keys\" as well."),
-    chosen<&StorebagChoices::follow>("openSessions", "follow", "a session keeps the section of its start",
-                                     "Gives open sessions the new section of a storebag that changed."),
-};
+    choiceRow<&StorebagChoices::expiry>("expiry", "honour", "\"expires\" is not looked at",
+                                        "Refuses a storebag past its \"expires\" date and stops using one."),
+    choiceRow<&StorebagChoices::names>("names", "check", "\"name\" is not looked at",
+                                       "Refuses a storebag whose \"name\" is not the one asked for."),
+    choiceRow<&StorebagChoices::ed25519>("signature", "ed25519", "the RSA signature suffices",
+                                         "Asks for a good Ed25519 signature by one of \"keys\" as well."),
+    choiceRow<&StorebagChoices::follow>("openSessions", "follow", "a session keeps the section of its start",
+                                        "Gives open sessions the new section of a storebag that changed."),
+});
 
-constexpr std::array kFatesKeys{
-    row<&FatesChoices::bytes>({"bytes",
-                               integer,
-                               {64 << 10, 256 << 20},
-                               optional,
-                               "524288",
-                               "Size of the ring that keeps what became of messages. Read at start."})
-        .key,
-};
+constexpr auto kFatesKeys = keysOf<FatesChoices>({
+    row<&FatesChoices::bytes>({"bytes", integer, kRingBytes, optional, "524288",
+                               "Size of the ring that keeps what became of messages. Read at start."}),
+});
 
-constexpr std::array kSpoolKeys = keysOf<SpoolChoices>({
-    row<&SpoolChoices::bytes>({"bytes",
-                               integer,
-                               {1 << 20, kMostBytes},
-                               optional,
-                               "67108864",
+constexpr auto kSpoolKeys = keysOf<SpoolChoices>({
+    row<&SpoolChoices::bytes>({"bytes", integer, kSpoolBytes, optional, "67108864",
                                "Bytes of the files that failed posts are kept in."}),
     row<&SpoolChoices::days>(
         {"days", real, {1e-5, 36'500}, optional, "7", "Days for which a failed post is kept."}),
     row<&SpoolChoices::perUser>(
         {"perUser", real, {0.001, 1}, optional, "0.5", "Share of the bytes that one user id may take."}),
-    row<&SpoolChoices::postsPerSecond>({"postsPerSecond",
-                                        real,
-                                        {0.001, 1'000},
-                                        optional,
-                                        "4",
-                                        "Kept posts that leave for one address in a second."}),
+    row<&SpoolChoices::postsPerSecond>(
+        {"postsPerSecond", real, kPace, optional, "4", "Kept posts that leave for one address in a second."}),
     row<&SpoolChoices::firstWait>({"firstWait", real, kWait, optional, "30",
                                    "Seconds within which a failing address is tried again, at random."}),
     row<&SpoolChoices::longestWait>({"longestWait", real, kWait, optional, "900",
                                      "Seconds that this grows to: it doubles with each failure."}),
 });
 
-constexpr std::array kCompressionKeys{
+constexpr auto kCompressionKeys = keysOf<CompressionChoices>({
     row<&CompressionChoices::level>(
-        {"level", integer, {0, 9}, optional, "6", "zlib's level for event posts; 0: plain bodies."})
-        .key,
-};
+        {"level", integer, {0, 9}, optional, "6", "zlib's level for event posts; 0: plain bodies."}),
+});
 
-constexpr Key sampling() {
-  Key key =
-      row<&OperatorChoices::sampling>(
-          {"sampling", choice, kUnbounded, optional, "drawn",
-           "How a back end comes by its sampling factor: drawn at random, or derived from a secret of the "
-           "device, the storebag's name and its own, and so the same after every start."})
-          .key;
-  key.choices = "drawn|stable";
-  return key;
-}
-
-constexpr std::array kSettingsKeys{
-    sampling(),
+constexpr auto kSettingsKeys = keysOf<OperatorChoices>({
+    choiceRow<&OperatorChoices::sampling>(
+        "sampling", "drawn|stable", "drawn",
+        "How a back end comes by its sampling factor: drawn at random, or derived from a secret of the "
+        "device, the storebag's name and its own, and so the same after every start."),
     row<&OperatorChoices::storebags>({"storebags", dictionary, kUnbounded, optional, "none of them",
-                                      "What is done with storebags.", &StorebagChoices::kKeys})
-        .key,
+                                      "What is done with storebags.", &StorebagChoices::kKeys}),
     row<&OperatorChoices::keys>(
         {"keys", texts, kUnbounded, optional, "publicKey.der alone",
          "Names of files in etc/veltrad/keys with further public keys, RSA or Ed25519, DER or PEM. A "
          "storebag "
-         "is taken by any RSA key of them and publicKey.der that no accepted storebag names in \"revoked\"."})
-        .key,
+         "is taken by any RSA key of them and publicKey.der that no accepted storebag names in "
+         "\"revoked\"."}),
     row<&OperatorChoices::fates>({"fates", dictionary, kUnbounded, optional, "as its keys say",
-                                  "The record of what became of messages.", &FatesChoices::kKeys})
-        .key,
+                                  "The record of what became of messages.", &FatesChoices::kKeys}),
     row<&OperatorChoices::spool>({"spool", dictionary, kUnbounded, optional, "no spool",
                                   "Failed posts are kept on disk and sent again. Read at start.",
-                                  &SpoolChoices::kKeys})
-        .key,
+                                  &SpoolChoices::kKeys}),
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
-                                        "How event posts are compressed.", &CompressionChoices::kKeys})
-        .key,
+                                        "How event posts are compressed.", &CompressionChoices::kKeys}),
     row<&OperatorChoices::jitter>(
-        {"jitter",
-         real,
-         {0, 1},
-         optional,
-         "0",
+        {"jitter", real, kShare, optional, "0",
          "Share by which the times between fetches of a storebag are spread, so that devices do not ask at "
          "once: up to that share of its refresh cycle sooner, or of it later than 900 seconds after a "
          "failure. "
-         "Each device draws anew for each fetch."})
-        .key,
-};
+         "Each device draws anew for each fetch."}),
+});
 
 }  // namespace
 

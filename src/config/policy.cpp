@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "base/text.h"
+#include "config/choice_row.h"
 #include "config/settings_check.h"
 #include "platform/local_settings.h"
 
@@ -17,62 +18,43 @@ using enum Need;
 // What a double counts exactly.
 constexpr double kMostCount = 9'007'199'254'740'992;
 constexpr Range kCount{0, kMostCount};
-
-constexpr Key withChoices(Key key, const char* choices) {
-  key.choices = choices;
-  return key;
-}
+constexpr Range kHistoryBytes{65'536, kMostCount};
 
 constexpr auto kHistoryKeys = keysOf<HistoryBounds>({
     row<&HistoryBounds::days>(
         {"days", integer, {1, 36'500}, optional, "7", "Days for which what left is kept."}),
-    row<&HistoryBounds::bytes>({"bytes",
-                                integer,
-                                {65'536, kMostCount},
-                                optional,
-                                "67108864",
+    row<&HistoryBounds::bytes>({"bytes", integer, kHistoryBytes, optional, "67108864",
                                 "Bytes that what left may take on disk; the oldest goes first."}),
 });
 
-constexpr std::array kPolicyKeys{
-    withChoices(row<&PolicyRules::reporting>({"reporting", choice, kUnbounded, optional, "on",
-                                              "\"off\": no back end reports, and what waits is dropped."})
-                    .key,
-                "on|off"),
-    withChoices(row<&PolicyRules::consent>(
-                    {"consent", choice, kUnbounded, optional, "storebag",
-                     "\"always\": without the user's consent no back end of any kind reports, whatever the "
-                     "storebag or the client says; \"storebag\": the storebag decides."})
-                    .key,
-                "storebag|always"),
+constexpr auto kPolicyKeys = keysOf<PolicyRules>({
+    choiceRow<&PolicyRules::reporting>("reporting", "on|off", "on",
+                                       "\"off\": no back end reports, and what waits is dropped."),
+    choiceRow<&PolicyRules::consent>(
+        "consent", "storebag|always", "storebag",
+        "\"always\": without the user's consent no back end of any kind reports, whatever the "
+        "storebag or the client says; \"storebag\": the storebag decides."),
     row<&PolicyRules::backends>({"backends", texts, kUnbounded, optional, "all",
-                                 "Names of the back ends that are made; others are not."})
-        .key,
+                                 "Names of the back ends that are made; others are not."}),
     row<&PolicyRules::hosts>(
         {"hosts", texts, kUnbounded, optional, "all",
          "Host names and addresses that may be contacted; \"*.example.com\" means the names below it. The "
-         "storebag server must be among them."})
-        .key,
+         "storebag server must be among them."}),
     row<&PolicyRules::remove>({"remove", texts, kUnbounded, optional, "none",
                                "Names of fields that are taken out of every message before anything sees it; "
-                               "letter case is ignored."})
-        .key,
+                               "letter case is ignored."}),
     row<&PolicyRules::hash>({"hash", texts, kUnbounded, optional, "none",
                              "Names of fields whose values are replaced by a digest with a secret of this "
-                             "device; letter case is ignored."})
-        .key,
+                             "device; letter case is ignored."}),
     row<&PolicyRules::dailyEvents>(
         {"dailyEvents", integer, kCount, optional, "no limit",
-         "Events, datagrams, files and log data that leave in a day (UTC), all destinations together."})
-        .key,
+         "Events, datagrams, files and log data that leave in a day (UTC), all destinations together."}),
     row<&PolicyRules::dailyBytes>({"dailyBytes", integer, kCount, optional, "no limit",
-                                   "Bytes that leave in a day (UTC), all destinations together."})
-        .key,
+                                   "Bytes that leave in a day (UTC), all destinations together."}),
     row<&PolicyRules::history>({"history", dictionary, kUnbounded, optional, "nothing is kept",
                                 "What left is kept, exactly as it left, for the owner to read.",
-                                &HistoryBounds::kKeys})
-        .key,
-};
+                                &HistoryBounds::kKeys}),
+});
 
 // Without the brackets of an IPv6 address and the dot at the end of a complete name.
 std::string comparable(std::string_view host) {

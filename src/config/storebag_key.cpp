@@ -2,7 +2,6 @@
 // Verifies signatures with OpenSSL's EVP interface, which checks digest and padding.
 #include "config/storebag_key.h"
 
-#include <fmt/format.h>
 #include <openssl/bn.h>
 #include <openssl/core_names.h>
 #include <openssl/decoder.h>
@@ -14,6 +13,7 @@
 #include <openssl/x509.h>
 
 #include "base/freed.h"
+#include "base/text.h"
 
 namespace veltrad::config {
 namespace {
@@ -146,13 +146,9 @@ std::string StorebagKey::fingerprint() const {
   const std::unique_ptr<unsigned char, OpenSSLFree> held(der);
   unsigned char digest[EVP_MAX_MD_SIZE];
   std::size_t length = 0;
-  std::string text;
-  if (size <= 0 || EVP_Q_digest(_held->library.get(), "SHA256", nullptr, der, static_cast<std::size_t>(size),
-                                digest, &length) != 1) {
-    return text;
-  }
-  for (std::size_t i = 0; i < length; ++i) text += fmt::format("{:02x}", digest[i]);
-  return text;
+  const bool digested = size > 0 && EVP_Q_digest(_held->library.get(), "SHA256", nullptr, der,
+                                                 static_cast<std::size_t>(size), digest, &length) == 1;
+  return digested ? hex({reinterpret_cast<const char*>(digest), length}) : "";
 }
 
 int StorebagKey::modulusBits() const {

@@ -21,7 +21,6 @@ namespace {
 using Cause = StorebagCause;
 
 constexpr std::size_t kMostKeyBytes = 1u << 16;
-// Each may cost a verification of every storebag.
 
 bool isFileName(const std::string& text) {
   return !text.empty() && text != "." && text != ".." && text.find('/') == std::string::npos &&
