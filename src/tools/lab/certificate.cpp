@@ -9,7 +9,6 @@
 #include <openssl/x509v3.h>
 
 #include <cstdint>
-#include <memory>
 
 #include "base/freed.h"
 #include "platform/file_store.h"

@@ -12,7 +12,5 @@ struct Arrivals;
 // A page with the addresses of the servers, one per line, and the newest arrivals. It reloads itself every
 // two seconds.
 std::string livePage(const std::vector<std::string>& addresses, Arrivals& arrivals);
-// Escapes a text, so that what clients send is never markup.
-std::string escapedForHTML(const std::string& text);
 
 }  // namespace veltrad::lab

@@ -5,7 +5,6 @@
 #include <memory>
 #include <string>
 
-#include "answers.h"
 #include "arrivals.h"
 #include "dashboard.h"
 #include "directory.h"
