@@ -155,11 +155,20 @@ class Workshop(unittest.TestCase):
         self.assertRegex(error, r'suite:1:\d+: unknown key "clientTyp" in "given": did you mean "clientType"')
         suite["cases"] = [{"given": {"clientType": 7}, "expect": {"htppost": {"absent": ["peer"]}}}]
         self.assertIn('unknown back end "htppost": did you mean "httppost"?', run("test", self.file("suite", suite))[2])
-
+        suite["cases"] = [{"given": {"clientType": 7}, "expect": {"httppost": {"zone": 1}}}]
+        self.assertIn('unknown key "zone": expected one of state, reason, present, absent, hashed, equal', run("test", self.file("suite", suite))[2])
+        for key, value, expected in (("state", "2", "an integer from 0 to 3, or null"), ("state", 4, "an integer from 0 to 3, or null"),
+                                     ("reason", 2, "the name of a reason"), ("absent", "peer", "an array of fields"),
+                                     ("equal", ["n"], "an object of fields")):  # which none could fail
+            suite["cases"] = [{"given": {"clientType": 7}, "expect": {"httppost": {key: value}}}]
+            told = run("test", self.file("suite", suite))
+            self.assertEqual((told[0], told[1]), (1, ""), key)
+            self.assertIn(f'"{key}" is {json.dumps(value, separators=(",", ":"))}: expected {expected}', told[2])
 
     def test_what_is_played_is_checked(self):
         bare, files = self.file("bag", bag()), {
-            "device": '{"DeviceNam": "Elm"}', "policy.json": '{\n  "hosts": "a.example"}', "messages": '\n{"op": "send", "category": 7}\n'}
+            "device": '{"DeviceNam": "Elm"}', "policy.json": '{\n  "hosts": "a.example"}', "messages": '\n{"op": "send", "category": 7}\n',
+            "flags": '{"op": "send", "category": 7, "type": 1, "flag": "realtime"}'}
         files = {name: self.file(name, content) for name, content in files.items()}
         for options, status, said in (
                 (("--draw", "httppst=0.5"), 2, 'unknown back end "httppst": did you mean "httppost"?'),
@@ -169,7 +178,8 @@ class Workshop(unittest.TestCase):
                 (("--category", "5"), 1, "a message needs --category and --type"),
                 (("--device", files["device"]), 1, f'{files["device"]}: unknown key "DeviceNam": did you mean "DeviceName"?'),
                 (("--policy", files["policy.json"]), 1, f'{files["policy.json"]}:2:3: "hosts" is "a.example": expected an array of texts'),
-                (("--messages", files["messages"]), 1, f'{files["messages"]}:2:1: "type" is missing: expected an integer')):
+                (("--messages", files["messages"]), 1, f'{files["messages"]}:2:1: "type" is missing: expected an integer'),
+                (("--messages", files["flags"]), 1, f'{files["flags"]}:1:1: "flag" is "realtime": expected an integer of 32 bits')):
             told = run("explain", bare, *options)
             self.assertEqual((told[0], told[1]), (status, ""), options)
             self.assertIn(said, told[2])

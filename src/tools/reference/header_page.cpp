@@ -4,6 +4,7 @@
 
 #include <algorithm>
 
+#include "base/text.h"
 #include "tools/reference/markdown.h"
 
 namespace veltrad::reference {
@@ -11,12 +12,6 @@ namespace {
 
 constexpr std::string_view kExported = "VELTRA_API ";
 constexpr std::string_view kTitle = "---- ";
-
-std::string_view trimmed(std::string_view text) {
-  const std::size_t first = text.find_first_not_of(' ');
-  if (first == std::string_view::npos) return {};
-  return text.substr(first, text.find_last_not_of(' ') - first + 1);
-}
 
 class HeaderPage {
  public:
@@ -26,7 +21,7 @@ class HeaderPage {
       _inComment = true;
       line.remove_prefix(2);
     } else if (_inComment) {
-      line = trimmed(line);
+      line = trimmed(line, " ");
       if (line.starts_with("*") && !line.starts_with("*/")) line.remove_prefix(1);
     }
     if (_inComment) return takeComment(line);
@@ -48,7 +43,7 @@ class HeaderPage {
  private:
   void takeComment(std::string_view line) {
     const std::size_t close = line.find("*/");
-    const std::string_view text = trimmed(line.substr(0, close));
+    const std::string_view text = trimmed(line.substr(0, close), " ");
     if (text.starts_with(kTitle)) {
       const std::size_t end = text.rfind(" ----");
       _page += "\n### " + escaped(text.substr(kTitle.size(), end - kTitle.size())) + "\n";

@@ -4,7 +4,6 @@
 #include "datagrams.h"
 
 #include <cstring>
-#include <optional>
 #include <string>
 
 #include "backends/dashboard/delivery_schedule.h"

@@ -2,7 +2,6 @@
 // Asks the daemon's UnseededSequence, stableSamplingFactor, decideOnClient and EventBatch.
 #include "sampling.h"
 
-#include <algorithm>
 #include <string>
 
 #include "backends/backend.h"

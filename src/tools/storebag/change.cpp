@@ -25,6 +25,11 @@ const char* nameOf(Effect effect) {
   return kEffectNames[static_cast<std::size_t>(effect)];
 }
 
+std::optional<Value> valueIn(const Dictionary* dictionary, const std::string& key) {
+  const Value* value = dictionary ? dictionary->find(key) : nullptr;
+  return value ? std::optional(*value) : std::nullopt;
+}
+
 Effect worstOf(const std::vector<Change>& changes) {
   Effect worst = Effect::other;
   for (const Change& change : changes) worst = std::min(worst, change.effect);

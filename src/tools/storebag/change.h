@@ -57,6 +57,9 @@ struct Change {
   std::string text;
 };
 
+// As it is written; nothing: it is not there.
+std::optional<Value> valueIn(const Dictionary* dictionary, const std::string& key);
+
 // What "more", "less" and "other" are together.
 Effect worstOf(const std::vector<Change>& changes);
 void sortWorstFirst(std::vector<Change>& changes);
@@ -72,7 +75,11 @@ class ChangeSink {
     _changes.push_back(
         {kind, effect, _at, std::move(key), std::move(before), std::move(now), std::move(text)});
   }
-  const ChangePlace& place() const { return _at; }
+  // Of a key of the dictionary that is there, as it was and as it is; null: there is none.
+  void sayKey(ChangeKind kind, Effect effect, const std::string& key, const Dictionary* before,
+              const Dictionary* now, std::string text) {
+    say(kind, effect, key, valueIn(before, key), valueIn(now, key), std::move(text));
+  }
 
  private:
   std::vector<Change>& _changes;

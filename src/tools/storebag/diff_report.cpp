@@ -2,11 +2,14 @@
 // Says changes as JSON and to people.
 #include <fmt/format.h>
 
-#include "storebag/null_value.h"
 #include "storebag/storebag_diff.h"
+#include "tools/null_value.h"
 
 namespace veltrad::storebag {
 namespace {
+
+using tools::nullValue;
+using tools::orNull;
 
 std::string pathOf(const ChangePlace& at) {
   std::string path = at.section.value_or("");
@@ -45,7 +48,7 @@ Dictionary changeAsDictionary(const Change& change) {
 }
 
 Value messagesAsValue(const std::optional<MessageChanges>& messages) {
-  if (!messages) return unknownValue();
+  if (!messages) return nullValue();
   Array list;
   for (const ChangedMessage& one : messages->changed)
     list.emplace_back(Dictionary{{"line", one.line}, {"was", one.was}, {"is", one.is}});

@@ -9,7 +9,6 @@
 #include <vector>
 
 #include "config/field_rules.h"
-#include "config/storebag_content.h"
 #include "session/backend_set.h"
 #include "storebag/dry_world.h"
 #include "storebag/explanation.h"

@@ -8,7 +8,6 @@
 #include <cctype>
 #include <cstdint>
 #include <iterator>
-#include <optional>
 #include <set>
 #include <string>
 #include <vector>
@@ -102,10 +101,8 @@ bool isKnownAction(const std::string& action) {
                                               [&](const auto& row) { return action == row.first; });
 }
 
-}  // namespace
-
 // One that can be compared with others.
-struct EntryCheck::Filter {
+struct Filter {
   std::size_t number;
   std::string key;  // in lower case
   filterTag content;
@@ -119,7 +116,57 @@ struct EntryCheck::Filter {
   bool keeps() const { return content.action == FilterAction::keep; }
 };
 
-void EntryCheck::checkEntries(const Spot& at, const Array& entries) const {
+void checkAction(LintSink& sink, const Spot& at, const Dictionary& filter) {
+  const std::string* action = filter.string("action");
+  const bool isMisnamed = std::any_of(filter.begin(), filter.end(), [](const auto& entry) {
+    return !filterTag::kKeys.find(entry.first) && closestName(entry.first, {"action"});
+  });
+  if (action == nullptr && !filter.contains("action") && !isMisnamed)
+    return sink.say(filter_without_action, at, "no \"action\": the field leaves the device in clear");
+  if (action == nullptr || isKnownAction(*action)) return;
+  std::vector<std::string> known{kKeepAction};
+  for (const auto& row : config::kFilterActions) known.emplace_back(row.first);
+  const auto meant = closestName(*action, known);
+  const std::string question = meant ? fmt::format("; did you mean {}?", quoted(*meant)) : "";
+  sink.say(
+      unknown_action, at.key("action"),
+      fmt::format("unknown action {}: the field leaves the device in clear{}", quoted(*action), question));
+}
+
+// Of the filter at `place` among all.
+void checkFilter(LintSink& sink, const Spot& at, const std::vector<Filter>& filters, std::size_t place) {
+  const Filter& filter = filters[place];
+  const auto end = filters.begin() + static_cast<std::ptrdiff_t>(place);
+  const auto above =
+      std::find_if(filters.begin(), end, [&](const Filter& other) { return other.fitsWhenever(filter); });
+  const std::string field = quoted(*filter.content.key);
+  if (above != end)
+    sink.say(filter_never_applies, at,
+             fmt::format("never applies: filter [{}] decides on {} first", above->number, field));
+  else if (filter.content.method > kMostCode || filter.content.status > kMostCode)
+    sink.say(filter_never_applies, at,
+             fmt::format("never applies: no method and no status is above {}", kMostCode),
+             "Write the category of the messages as \"method\", their type as \"status\".");
+  if (filter.keeps()) return;
+  if (filter.content.action == FilterAction::sha256 && hasFewValues(*filter.content.key))
+    sink.say(guessable_hash, at,
+             fmt::format("the digest of {} can be found by trying all values that there are", field));
+  if (filter.fitsFlush()) return;
+  const auto flush = std::find_if(filters.begin(), filters.end(), [&](const Filter& other) {
+    return other.key == filter.key && other.fitsFlush();
+  });
+  if (flush == filters.end() || flush->keeps())
+    sink.say(
+        filter_undone_by_flush, at,
+        fmt::format("holds for one method or status alone: if {} is in the user info, the flush of a batch "
+                    "adds it again in clear",
+                    field),
+        fmt::format("Add {{\"key\": {}, \"action\": \"remove\"}} below it.", field));
+}
+
+}  // namespace
+
+void checkEntries(LintSink& sink, const Spot& at, const Array& entries) {
   std::vector<Numbered> above;
   for (std::size_t i = 0; i < entries.size(); ++i) {
     const Dictionary* dictionary = entries[i].asDictionary();
@@ -128,88 +175,41 @@ void EntryCheck::checkEntries(const Spot& at, const Array& entries) const {
     const auto same =
         std::find_if(above.begin(), above.end(), [&](const Clientele& other) { return entry == other; });
     if (same != above.end()) {
-      _sink.say(
+      sink.say(
           duplicate_entry, at.element(i),
           fmt::format("the same clients and services as entry [{}], which is used even where it refuses: "
                       "this one never is",
                       same->number));
     } else if (const auto shadows = shadowsOf(entry, above); !shadows.empty()) {
-      _sink.say(shadowed_entry, at.element(i),
-                fmt::format("never used: everyone whom it fits has {} {} first",
-                            shadows.size() == 1 ? "entry" : "entries", listedNumbers(shadows)),
-                fmt::format("Put it above {}, or take it out.", listedNumbers({*shadows.begin()})));
+      sink.say(shadowed_entry, at.element(i),
+               fmt::format("never used: everyone whom it fits has {} {} first",
+                           shadows.size() == 1 ? "entry" : "entries", listedNumbers(shadows)),
+               fmt::format("Put it above {}, or take it out.", listedNumbers({*shadows.begin()})));
     }
     above.push_back(entry);
   }
 }
 
-void EntryCheck::checkFilters(const Spot& at, const Array& filters) const {
+void checkFilters(LintSink& sink, const Spot& at, const Array& filters) {
   std::vector<Filter> read;
   for (std::size_t i = 0; i < filters.size(); ++i) {
     const Dictionary* dictionary = filters[i].asDictionary();
     if (dictionary == nullptr) continue;
-    checkAction(at.element(i), *dictionary);
+    checkAction(sink, at.element(i), *dictionary);
     const auto filter = config::parsed<filterTag>(*dictionary);
     if (filter.key) read.push_back({i, lowerCase(*filter.key), filter});
   }
-  for (std::size_t i = 0; i < read.size(); ++i) checkFilter(at.element(read[i].number), read, i);
+  for (std::size_t i = 0; i < read.size(); ++i) checkFilter(sink, at.element(read[i].number), read, i);
 }
 
-void EntryCheck::checkAction(const Spot& at, const Dictionary& filter) const {
-  const std::string* action = filter.string("action");
-  const bool isMisnamed = std::any_of(filter.begin(), filter.end(), [](const auto& entry) {
-    return !filterTag::kKeys.find(entry.first) && closestName(entry.first, {"action"});
-  });
-  if (action == nullptr && !filter.contains("action") && !isMisnamed)
-    return _sink.say(filter_without_action, at, "no \"action\": the field leaves the device in clear");
-  if (action == nullptr || isKnownAction(*action)) return;
-  std::vector<std::string> known{kKeepAction};
-  for (const auto& row : config::kFilterActions) known.emplace_back(row.first);
-  const auto meant = closestName(*action, known);
-  const std::string question = meant ? fmt::format("; did you mean {}?", quoted(*meant)) : "";
-  _sink.say(
-      unknown_action, at.key("action"),
-      fmt::format("unknown action {}: the field leaves the device in clear{}", quoted(*action), question));
-}
-
-void EntryCheck::checkFilter(const Spot& at, const std::vector<Filter>& filters, std::size_t place) const {
-  const Filter& filter = filters[place];
-  const auto end = filters.begin() + static_cast<std::ptrdiff_t>(place);
-  const auto above =
-      std::find_if(filters.begin(), end, [&](const Filter& other) { return other.fitsWhenever(filter); });
-  const std::string field = quoted(*filter.content.key);
-  if (above != end)
-    _sink.say(filter_never_applies, at,
-              fmt::format("never applies: filter [{}] decides on {} first", above->number, field));
-  else if (filter.content.method > kMostCode || filter.content.status > kMostCode)
-    _sink.say(filter_never_applies, at,
-              fmt::format("never applies: no method and no status is above {}", kMostCode),
-              "Write the category of the messages as \"method\", their type as \"status\".");
-  if (filter.keeps()) return;
-  if (filter.content.action == FilterAction::sha256 && hasFewValues(*filter.content.key))
-    _sink.say(guessable_hash, at,
-              fmt::format("the digest of {} can be found by trying all values that there are", field));
-  if (filter.fitsFlush()) return;
-  const auto flush = std::find_if(filters.begin(), filters.end(), [&](const Filter& other) {
-    return other.key == filter.key && other.fitsFlush();
-  });
-  if (flush == filters.end() || flush->keeps())
-    _sink.say(
-        filter_undone_by_flush, at,
-        fmt::format("holds for one method or status alone: if {} is in the user info, the flush of a batch "
-                    "adds it again in clear",
-                    field),
-        fmt::format("Add {{\"key\": {}, \"action\": \"remove\"}} below it.", field));
-}
-
-void EntryCheck::checkConsent(const Spot& at, const Dictionary& entry) const {
+void checkConsent(LintSink& sink, const Spot& at, const Dictionary& entry) {
   if (entry.int32("override_dnu") != 1) return;
-  _sink.say(overrides_consent, at.key("override_dnu"),
-            "\"override_dnu\" is 1: the clients of this entry report for users who have not consented, too");
+  sink.say(overrides_consent, at.key("override_dnu"),
+           "\"override_dnu\" is 1: the clients of this entry report for users who have not consented, too");
   const Array* filters = entry.array("filters");
   if (filters != nullptr && filters->empty())
-    _sink.say(reports_without_consent, at, "reports without consent, and without filters everything in clear",
-              "Add filters for what need not leave the device.");
+    sink.say(reports_without_consent, at, "reports without consent, and without filters everything in clear",
+             "Add filters for what need not leave the device.");
 }
 
 }  // namespace veltrad::storebag

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Tells of each back end what a dry run shows.
 #include <algorithm>
-#include <cmath>
 
 #include "backends/dashboard/packet_text.h"
 #include "backends/dashboard/udp_socket.h"
@@ -10,12 +9,14 @@
 #include "config/storebag_section.h"
 #include "storebag/dry_run.h"
 #include "storebag/explanation.h"
-#include "storebag/null_value.h"
 #include "storebag/silence.h"
+#include "tools/null_value.h"
 #include "wire/constants.h"
 
 namespace veltrad::storebag {
 namespace {
+
+using tools::nullValue;
 
 using backends::SharedProfile;
 using config::ClientEntry;
@@ -26,8 +27,6 @@ constexpr std::uint32_t kReleaseEnvironment = 4;
 // Each run has its own.
 constexpr const char* kFactsOfARun[] = {"_startTS",   "_clientTS",       "eventTime",
                                         "_sessionID", "_timezoneOffset", "_reportVers"};
-
-const Value kUnknown = unknownValue();
 
 bool isContainer(const Value& value) {
   return value.asArray() || value.asDictionary() || value.asData();
@@ -103,7 +102,7 @@ config::EditedFields editsOfUserInfo(const DryRun& run, std::size_t message) {
 // Takes out of an event what another run would have different.
 void hideFactsOfARun(const DryRun& run, const Dictionary& plain, std::size_t message, Dictionary& event) {
   for (const char* key : kFactsOfARun)
-    if (event.contains(key)) event.set(key, kUnknown);
+    if (event.contains(key)) event.set(key, nullValue());
   const auto isKeyedDigest = [&](const std::string& key, const config::EditedFields& edits,
                                  const Dictionary& after) {
     const Value* given = after.find(key);
@@ -113,7 +112,7 @@ void hideFactsOfARun(const DryRun& run, const Dictionary& plain, std::size_t mes
   for (const auto& [key, value] : Dictionary(event)) {
     if (isKeyedDigest(key, run.editsOf(message), run.payloadOf(message)) ||
         (run.sentUserInfo() && isKeyedDigest(key, run.userInfoEdits(), *run.sentUserInfo())))
-      event.set(key, kUnknown);
+      event.set(key, nullValue());
   }
 }
 

@@ -4,11 +4,14 @@
 
 #include "formats/json.h"
 #include "storebag/explanation.h"
-#include "storebag/null_value.h"
 #include "storebag/words.h"
+#include "tools/null_value.h"
 
 namespace veltrad::storebag {
 namespace {
+
+using tools::nullValue;
+using tools::orNull;
 
 template <typename List>
 Array arrayOf(const List& items) {
@@ -71,7 +74,7 @@ std::string backendText(const std::string& name, const BackendExplanation& told)
 }  // namespace
 
 Dictionary asDictionary(const BackendExplanation& told) {
-  Value nearest = unknownValue();
+  Value nearest = nullValue();
   if (told.match.nearest)
     nearest = Dictionary{{"entry", *told.match.nearest}, {"differs", arrayOf(differencesOf(told.match))}};
   Array events;

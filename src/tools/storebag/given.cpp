@@ -17,7 +17,6 @@
 #include "storebag/lint_sink.h"
 #include "storebag/recording.h"
 #include "storebag/spelling.h"
-#include "storebag/words.h"
 #include "tools/key_value.h"
 #include "wire/constants.h"
 
@@ -39,32 +38,6 @@ std::optional<std::int64_t> wholeNumber(const Value& value, std::int64_t least, 
       value.type() == Value::Type::signedInteger || value.type() == Value::Type::unsignedInteger;
   const auto number = isInteger ? value.toInt64() : std::nullopt;
   return number && *number >= least && *number <= most ? number : std::nullopt;
-}
-
-std::optional<std::string> readUserInfo(const Value& value, Given& given) {
-  const Dictionary* info = value.asDictionary();
-  if (info == nullptr) return expected("userInfo", value, "an object").error;
-  for (const auto& [key, item] : *info) given.setUserInfo(key, item);
-  return std::nullopt;
-}
-
-std::optional<std::string> inKey(const char* key, const std::optional<std::string>& fault) {
-  return fault ? std::optional(fmt::format("\"{}\": {}", key, *fault)) : std::nullopt;
-}
-
-std::optional<std::string> readDraw(const Value& value, Given& given) {
-  const Dictionary* draws = value.asDictionary();
-  if (draws == nullptr) return inKey("draw", given.takeDraw("", value));
-  std::optional<std::string> fault;
-  for (const auto& [name, draw] : *draws)
-    if (!fault) fault = inKey("draw", given.takeDraw(name, draw));
-  return fault;
-}
-
-std::string mostLike(const std::string& name, const std::vector<std::string>& known) {
-  const auto meant = closestName(name, known);
-  return meant ? fmt::format(": did you mean {}?", quoted(*meant))
-               : fmt::format(": expected one of {}", listed(known));
 }
 
 Result<Dictionary, std::string> checkedDevice(Dictionary device, const std::string& where) {
@@ -104,91 +77,87 @@ Result<Dictionary, std::string> policyIn(const Value& value, const std::string& 
   return checkedPolicy(std::move(content));
 }
 
-std::optional<std::string> takeMessages(const Value& value, const std::string& directory, Given& given) {
-  if (const std::string* path = value.asString()) {
-    auto messages = readMessages(pathBeside(directory, *path));
-    if (!messages) return messages.error();
-    given.messages = std::move(messages).value();
-    return std::nullopt;
+// A key of "given" and its value. Paths are relative to `directory`.
+struct Reading {
+  const char* key;
+  const Value& value;
+  const std::string& directory;
+  Given& given;
+
+  Fault expected(const char* what) const { return storebag::expected(key, value, what).error; }
+  Fault within(const Fault& fault) const {
+    return fault ? std::optional(fmt::format("\"{}\": {}", key, *fault)) : std::nullopt;
   }
-  const Array* array = value.asArray();
-  if (array == nullptr) return expected("messages", value, "an array of objects or the path of a file").error;
+  std::string text() const { return value.toText().value_or(""); }
+};
+
+Fault readClientType(const Reading& read) {
+  const auto type = wholeNumber(read.value, 0, config::kVeltraClientTypeCount - 1);
+  if (!type) return read.expected("an integer from 0 to 17");
+  read.given.clientType = static_cast<std::int32_t>(*type);
+  return std::nullopt;
+}
+
+Fault readName(const Reading& read, const char* name) {
+  if (!read.value.asString()) return read.expected("a text");
+  read.given.setUserInfo(name, read.value);
+  return std::nullopt;
+}
+
+Fault readUserInfo(const Reading& read) {
+  const Dictionary* info = read.value.asDictionary();
+  if (info == nullptr) return read.expected("an object");
+  for (const auto& [key, item] : *info) read.given.setUserInfo(key, item);
+  return std::nullopt;
+}
+
+Fault readFlag(const Reading& read, bool& flag) {
+  if (!read.value.isBoolean()) return read.expected("true or false");
+  flag = *read.value.toBoolean();
+  return std::nullopt;
+}
+
+Fault readDraw(const Reading& read) {
+  const Dictionary* draws = read.value.asDictionary();
+  if (draws == nullptr) return read.within(read.given.takeDraw("", read.value));
+  Fault fault;
+  for (const auto& [name, draw] : *draws)
+    if (!fault) fault = read.within(read.given.takeDraw(name, draw));
+  return fault;
+}
+
+Fault readMessagesOf(const Reading& read) {
+  if (const std::string* path = read.value.asString())
+    return taken(readMessages(pathBeside(read.directory, *path)), read.given.messages);
+  const Array* array = read.value.asArray();
+  if (array == nullptr) return read.expected("an array of objects or the path of a file");
   for (const Value& item : *array) {
-    auto message = messageOf(item);
-    if (!message) return "\"messages\": " + message.error();
-    given.messages.push_back(std::move(message).value());
+    if (const Fault fault = taken(messageOf(item), read.given.messages.emplace_back()))
+      return read.within(fault);
   }
   return std::nullopt;
 }
 
 struct GivenKey {
   const char* name;
-  // What is wrong; nothing: it was read.
-  std::optional<std::string> (*read)(const Value&, const std::string& directory, Given&);
+  Fault (*read)(const Reading&);
 };
-
-std::optional<std::string> readName(const char* key, const char* name, const Value& value, Given& given) {
-  if (!value.asString()) return expected(key, value, "a text").error;
-  given.setUserInfo(name, value);
-  return std::nullopt;
-}
-
-std::optional<std::string> readFlag(const char* key, const Value& value, bool& flag) {
-  if (!value.isBoolean()) return expected(key, value, "true or false").error;
-  flag = *value.toBoolean();
-  return std::nullopt;
-}
-
 constexpr GivenKey kKeys[] = {
-    {"clientType",
-     [](const Value& value, const std::string&, Given& given) -> std::optional<std::string> {
-       const auto type = wholeNumber(value, 0, config::kVeltraClientTypeCount - 1);
-       if (!type) return expected("clientType", value, "an integer from 0 to 17").error;
-       given.clientType = static_cast<std::int32_t>(*type);
-       return std::nullopt;
-     }},
-    {"environment",
-     [](const Value& value, const std::string&, Given& given) {
-       return inKey("environment", given.takeEnvironment(value.toText().value_or("")));
-     }},
-    {"client",
-     [](const Value& value, const std::string&, Given& given) {
-       return readName("client", wire::kVeltraUserInfoClientName, value, given);
-     }},
-    {"service",
-     [](const Value& value, const std::string&, Given& given) {
-       return readName("service", wire::kVeltraUserInfoServiceName, value, given);
-     }},
-    {"userInfo",
-     [](const Value& value, const std::string&, Given& given) { return readUserInfo(value, given); }},
-    {"requireUserInfo",
-     [](const Value& value, const std::string&, Given& given) {
-       return readFlag("requireUserInfo", value, given.requireUserInfo);
-     }},
-    {"batchEvents", [](const Value& value, const std::string&,
-                       Given& given) { return readFlag("batchEvents", value, given.batchEvents); }},
-    {"country",
-     [](const Value& value, const std::string&, Given& given) {
-       return inKey("country", given.takeCountry(value.toText().value_or("")));
-     }},
-    {"consent", [](const Value& value, const std::string&,
-                   Given& given) { return readFlag("consent", value, given.consent); }},
+    {"clientType", readClientType},
+    {"environment", [](const Reading& read) { return read.within(read.given.takeEnvironment(read.text())); }},
+    {"client", [](const Reading& read) { return readName(read, wire::kVeltraUserInfoClientName); }},
+    {"service", [](const Reading& read) { return readName(read, wire::kVeltraUserInfoServiceName); }},
+    {"userInfo", readUserInfo},
+    {"requireUserInfo", [](const Reading& read) { return readFlag(read, read.given.requireUserInfo); }},
+    {"batchEvents", [](const Reading& read) { return readFlag(read, read.given.batchEvents); }},
+    {"country", [](const Reading& read) { return read.within(read.given.takeCountry(read.text())); }},
+    {"consent", [](const Reading& read) { return readFlag(read, read.given.consent); }},
     {"device",
-     [](const Value& value, const std::string& directory, Given& given) -> std::optional<std::string> {
-       auto device = deviceIn(value, directory);
-       if (!device) return device.error();
-       given.device = std::move(device).value();
-       return std::nullopt;
-     }},
-    {"draw", [](const Value& value, const std::string&, Given& given) { return readDraw(value, given); }},
-    {"messages", takeMessages},
+     [](const Reading& read) { return taken(deviceIn(read.value, read.directory), read.given.device); }},
+    {"draw", readDraw},
+    {"messages", readMessagesOf},
     {"policy",
-     [](const Value& value, const std::string& directory, Given& given) -> std::optional<std::string> {
-       auto policy = policyIn(value, directory);
-       if (!policy) return policy.error();
-       given.policy = std::move(policy).value();
-       return std::nullopt;
-     }},
+     [](const Reading& read) { return taken(policyIn(read.value, read.directory), read.given.policy); }},
 };
 
 }  // namespace
@@ -198,14 +167,14 @@ void Given::setUserInfo(std::string key, Value value) {
   userInfo->set(std::move(key), std::move(value));
 }
 
-std::optional<std::string> Given::takeUserInfo(const std::string& text) {
+Fault Given::takeUserInfo(const std::string& text) {
   auto entry = tools::parseKeyValue(text);
   if (!entry) return entry.error();
   setUserInfo(std::move(entry.value().first), std::move(entry.value().second));
   return std::nullopt;
 }
 
-std::optional<std::string> Given::takeEnvironment(const std::string& name) {
+Fault Given::takeEnvironment(const std::string& name) {
   std::vector<std::string> known;
   for (std::uint32_t number = 1; const char* section = config::sectionNameForEnvironment(number); ++number) {
     if (name == section || name == std::to_string(number)) {
@@ -217,13 +186,13 @@ std::optional<std::string> Given::takeEnvironment(const std::string& name) {
   return fmt::format("{} is no environment{}", quoted(name), mostLike(name, known));
 }
 
-std::optional<std::string> Given::takeCountry(const std::string& code) {
+Fault Given::takeCountry(const std::string& code) {
   country = platform::countryOfLocaleName("xx_" + code);
   if (country) return std::nullopt;
   return fmt::format("{} is no country: expected two letters like US, or three digits", quoted(code));
 }
 
-std::optional<std::string> Given::takeDraw(const std::string& text) {
+Fault Given::takeDraw(const std::string& text) {
   const std::size_t equals = text.find('=');
   const bool named = equals != std::string::npos;
   const std::string number = named ? text.substr(equals + 1) : text;
@@ -231,16 +200,19 @@ std::optional<std::string> Given::takeDraw(const std::string& text) {
   return takeDraw(named ? text.substr(0, equals) : "", read ? read.value() : Value(number));
 }
 
-std::optional<std::string> Given::takeDraw(const std::string& backend, const Value& factor) {
-  std::vector<std::string> known;
-  for (const config::Key& key : config::StorebagSection::kKeys) known.emplace_back(key.name);
-  if (!backend.empty() && std::find(known.begin(), known.end(), backend) == known.end())
-    return fmt::format("unknown back end {}{}", quoted(backend), mostLike(backend, known));
+Fault Given::takeDraw(const std::string& backend, const Value& factor) {
+  if (!backend.empty() && !config::StorebagSection::kKeys.find(backend)) return unknownBackend(backend);
   const auto number = factor.isNumber() ? factor.toDouble() : std::nullopt;
   if (!number || *number < 0 || *number > 1)
     return fmt::format("{} is no sampling factor: expected a number from 0 to 1", shownValue(factor));
   (backend.empty() ? draw : draws[backend]) = *number;
   return std::nullopt;
+}
+
+std::string unknownBackend(const std::string& name) {
+  std::vector<std::string> known;
+  for (const config::Key& key : config::StorebagSection::kKeys) known.emplace_back(key.name);
+  return fmt::format("unknown back end {}{}", quoted(name), mostLike(name, known));
 }
 
 Result<GivenMessage, std::string> messageOf(const Value& value) {
@@ -256,7 +228,11 @@ Result<GivenMessage, std::string> messageOf(const Value& value) {
                                  item ? shownValue(*item) : "missing", kMostMessageCode)};
     *number = static_cast<std::uint16_t>(*code);
   }
-  given.flag = message->int32(wire::kVeltraMessageParametersFlag).value_or(0);
+  if (const Value* flag = message->find(wire::kVeltraMessageParametersFlag)) {
+    const auto bits = wholeNumber(*flag, INT32_MIN, INT32_MAX);
+    if (!bits) return expected(wire::kVeltraMessageParametersFlag, *flag, "an integer of 32 bits");
+    given.flag = static_cast<std::int32_t>(*bits);
+  }
   if (const Value* payload = message->find(wire::kVeltraMessageParametersPayload)) {
     if (!payload->asDictionary()) return expected("payload", *payload, "an object");
     given.payload = *payload->asDictionary();
@@ -294,7 +270,7 @@ Result<Given, std::string> givenOf(const Dictionary& dictionary, const std::stri
     known.emplace_back(key.name);
     const Value* value = dictionary.find(key.name);
     if (value == nullptr) continue;
-    if (const auto wrong = key.read(*value, directory, given)) return Failure{*wrong};
+    if (const Fault fault = key.read({key.name, *value, directory, given})) return Failure{*fault};
   }
   for (const auto& [name, value] : dictionary) {
     if (std::find(known.begin(), known.end(), name) != known.end()) continue;

@@ -6,13 +6,16 @@
 #include <map>
 #include <optional>
 #include <string>
-#include <string_view>
+#include <utility>
 #include <vector>
 
 #include "base/result.h"
 #include "base/value.h"
 
 namespace veltrad::storebag {
+
+// What is wrong with something that people write; nothing: it was taken.
+using Fault = std::optional<std::string>;
 
 struct GivenMessage {
   std::uint16_t category = 0;
@@ -43,16 +46,26 @@ struct Given {
   std::vector<GivenMessage> messages;
 
   void setUserInfo(std::string key, Value value);
-  // These take what people write, and return what is wrong with it: KEY=VALUE; the section or number of an
-  // environment; the country of a locale, "US" or "419" in letters of any case; a sampling factor from 0 to
-  // 1, or NAME=X of one back end.
-  std::optional<std::string> takeUserInfo(const std::string& text);
-  std::optional<std::string> takeEnvironment(const std::string& name);
-  std::optional<std::string> takeCountry(const std::string& code);
-  std::optional<std::string> takeDraw(const std::string& text);
+  // These take KEY=VALUE; the section or number of an environment; the country of a locale, "US" or "419" in
+  // letters of any case; a sampling factor from 0 to 1, or NAME=X of one back end.
+  Fault takeUserInfo(const std::string& text);
+  Fault takeEnvironment(const std::string& name);
+  Fault takeCountry(const std::string& code);
+  Fault takeDraw(const std::string& text);
   // An empty name is that of all back ends.
-  std::optional<std::string> takeDraw(const std::string& backend, const Value& factor);
+  Fault takeDraw(const std::string& backend, const Value& factor);
 };
+
+// Moves what was read into a field; the error is the fault.
+template <typename T, typename Field>
+Fault taken(Result<T, std::string> read, Field& field) {
+  if (!read) return read.error();
+  field = std::move(read).value();
+  return std::nullopt;
+}
+
+// Names the one that is not known, and those that are.
+std::string unknownBackend(const std::string& name);
 
 // {"category", "type", "flag", "payload"}; the error says what is wrong.
 Result<GivenMessage, std::string> messageOf(const Value& message);

@@ -3,7 +3,6 @@
 #include "storebag/json_layout.h"
 
 #include <algorithm>
-#include <optional>
 #include <vector>
 
 #include "config/storebag_content.h"

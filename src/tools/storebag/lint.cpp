@@ -15,7 +15,6 @@
 #include "storebag/spelling.h"
 #include "storebag/value_check.h"
 #include "storebag/words.h"
-#include "wire/constants.h"
 
 namespace veltrad::storebag {
 namespace {
@@ -58,7 +57,7 @@ const KeyTable* likelyTable(FindingName unknown, const Dictionary& content) {
 
 class Lint {
  public:
-  explicit Lint(const LintOptions& options) : _values(_sink, options.lab), _entries(_sink) {}
+  explicit Lint(const LintOptions& options) : _lab(options.lab) {}
 
   void checkDictionary(const Spot& at, const Dictionary& dictionary, const KeyTable& table) {
     sayDuplicates(at);
@@ -75,7 +74,7 @@ class Lint {
                   "Take the key out, or give it a value.");
         misnamed.insert(name);
       } else {
-        _values.check(at.key(name), *key, *value);
+        checkValue(_sink, _lab, at.key(name), *key, *value);
       }
       if (key && value) checkInside(at.key(name), *key, *value);
     }
@@ -153,10 +152,12 @@ class Lint {
       if (const Dictionary* element = elements[i].asDictionary())
         checkDictionary(at.element(i), *element, table);
       else
-        _values.sayNoDictionary(at.element(i), elements[i]);
+        _sink.say(wrong_type, at.element(i),
+                  fmt::format("{} is no dictionary, and is passed over", shownValue(elements[i])),
+                  "Take it out, or put a dictionary there.");
     }
-    if (&table == &config::ClientEntry::kKeys) _entries.checkEntries(at, elements);
-    if (&table == &config::filterTag::kKeys) _entries.checkFilters(at, elements);
+    if (&table == &config::ClientEntry::kKeys) checkEntries(_sink, at, elements);
+    if (&table == &config::filterTag::kKeys) checkFilters(_sink, at, elements);
   }
 
   void checkRequired(const Spot& at, const Key& key, const Value* value) {
@@ -193,7 +194,7 @@ class Lint {
             "no \"sampling_threshold\", not even for a country: refuses every client that requires user "
             "info",
             "Add \"sampling_threshold\": 1 for every device, 0.1 for every tenth.");
-      _entries.checkConsent(at, dictionary);
+      checkConsent(_sink, at, dictionary);
     } else if (&table == &config::DashboardProfile::kKeys) {
       checkDashboard(at, dictionary);
     } else if (&table == &config::UploadProfile::kKeys) {
@@ -215,9 +216,8 @@ class Lint {
               "a dashboard gets every message in clear, without consent, sampling or filters");
   }
 
+  const bool _lab;
   LintSink _sink;
-  const ValueCheck _values;
-  const EntryCheck _entries;
 };
 
 // What devices with the settings for it cannot read.

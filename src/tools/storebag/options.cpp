@@ -33,6 +33,11 @@ CLI::App* addCommand(CLI::App& app, const char* name, const char* about) {
   return app.add_subcommand(name, about)->group("Commands");
 }
 
+template <typename Target>
+CLI::Option* addFile(CLI::App& command, const char* name, Target& target, const char* help) {
+  return command.add_option(name, target, help)->type_name("FILE");
+}
+
 // Says what is wrong with the name of a finding; empty: nothing.
 std::string faultOfName(const std::string& name) {
   if (findingKindNamed(name)) return "";
@@ -55,14 +60,11 @@ void describeKeys(CLI::App& app, Arguments& given) {
       [&given] { given.outcome = storebag::keygen(given.directory, given.bits, given.ed25519Key); });
 
   CLI::App* sign = addCommand(app, "sign", "Sign a storebag in which lint finds no errors");
-  sign->add_option("--key", given.sign.privateKey, "Private key in PEM form")->type_name("FILE")->required();
+  addFile(*sign, "--key", given.sign.privateKey, "Private key in PEM form")->required();
   sign->add_option("IN", given.sign.in, "The storebag: a property list or JSON")->required();
-  sign->add_option("-o,--output", given.sign.out, "The signed container to write")
-      ->type_name("FILE")
-      ->required();
-  sign->add_option("--ed25519", given.sign.ed25519,
-                   "Ed25519 private key that signs as well; repeat the option for more")
-      ->type_name("FILE")
+  addFile(*sign, "-o,--output", given.sign.out, "The signed container to write")->required();
+  addFile(*sign, "--ed25519", given.sign.ed25519,
+          "Ed25519 private key that signs as well; repeat the option for more")
       ->allow_extra_args(false);
   sign->add_option("--serial", given.sign.serial, "Write this serial into the storebag first")
       ->type_name("N")
@@ -76,11 +78,9 @@ void describeKeys(CLI::App& app, Arguments& given) {
   sign->callback([&given] { given.outcome = storebag::sign(given.sign); });
 
   CLI::App* verify = addCommand(app, "verify", "Verify a signed storebag as the daemon does");
-  verify->add_option("--key", given.key, "Public key in DER form")->type_name("FILE")->required();
-  verify
-      ->add_option("--ed25519", given.ed25519,
-                   "Public key whose Ed25519 signature must be there, too, in DER or PEM form")
-      ->type_name("FILE");
+  addFile(*verify, "--key", given.key, "Public key in DER form")->required();
+  addFile(*verify, "--ed25519", given.ed25519,
+          "Public key whose Ed25519 signature must be there, too, in DER or PEM form");
   verify->add_option("FILE", given.file, "The container")->required();
   verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
 
@@ -89,13 +89,10 @@ void describeKeys(CLI::App& app, Arguments& given) {
   publish->positionals_at_end();  // the last one is DIR
   publish->add_option("FILE", given.publish.files, "Signed containers")->required();
   publish->add_option("DIR", given.publish.directory, "The folder that is served")->required();
-  publish->add_option("--key", given.publish.publicKey, "Public key in DER form that devices have")
-      ->type_name("FILE")
+  addFile(*publish, "--key", given.publish.publicKey, "Public key in DER form that devices have")
       ->capture_default_str();
-  publish
-      ->add_option("--ed25519", given.publish.ed25519,
-                   "Public key whose Ed25519 signature must be there, too, in DER or PEM form")
-      ->type_name("FILE");
+  addFile(*publish, "--ed25519", given.publish.ed25519,
+          "Public key whose Ed25519 signature must be there, too, in DER or PEM form");
   publish->callback([&given] { given.outcome = storebag::publish(given.publish); });
 
   CLI::App* rollback = addCommand(app, "rollback", "Serve again what was published before");
@@ -193,17 +190,14 @@ void addDevice(CLI::App& command, PlayedSession& played) {
           "Whether the user has consented: yes or no [yes]")
       ->type_name("WORD")
       ->check(CLI::IsMember({"yes", "no"}));
-  command.add_option("--device", played.device, "Properties of the device, with the keys of device.plist")
-      ->type_name("FILE");
-  command.add_option("--policy", played.policy, "Limits of the owner, as in policy.json")->type_name("FILE");
+  addFile(command, "--device", played.device, "Properties of the device, with the keys of device.plist");
+  addFile(command, "--policy", played.policy, "Limits of the owner, as in policy.json");
   addEach(command, "--draw",
           "Sampling factor of all back ends, or NAME=X of one; may be repeated [sampled in]",
           [&session](const std::string& text) { return session.takeDraw(text); })
       ->type_name("X");
-  command
-      .add_option("--messages", played.messages,
-                  "Messages as veltractl watch --json --contents and veltractl session have them")
-      ->type_name("FILE");
+  addFile(command, "--messages", played.messages,
+          "Messages as veltractl watch --json --contents and veltractl session have them");
 }
 
 void describePlaying(CLI::App& app, Arguments& given) {
@@ -217,8 +211,7 @@ void describePlaying(CLI::App& app, Arguments& given) {
       ->type_name("N")
       ->check(CLI::Range(0, 3));
   explain->add_option("ENTRY", given.explain.payload, "Entries of the message's payload: KEY=VALUE");
-  explain->add_option("--payload", given.explain.payloadFile, "The payload: one JSON object")
-      ->type_name("FILE");
+  addFile(*explain, "--payload", given.explain.payloadFile, "The payload: one JSON object");
   explain->add_flag("--json", given.explain.json, "Print one object");
   explain->callback([&given] { given.outcome = storebag::explain(given.explain); });
 
@@ -233,8 +226,7 @@ void describePlaying(CLI::App& app, Arguments& given) {
 
   CLI::App* test = addCommand(app, "test", "Run suites of cases that say what a storebag is to do");
   test->add_option("SUITE", given.test.suites, "Suites as JSON with comments")->required();
-  test->add_option("--junit", given.test.junit, "Also write the results there, for build servers")
-      ->type_name("FILE");
+  addFile(*test, "--junit", given.test.junit, "Also write the results there, for build servers");
   test->add_flag("--json", given.test.json, "Print one object");
   test->callback([&given] { given.outcome = storebag::test(given.test); });
 }

@@ -16,15 +16,13 @@ namespace veltrad::storebag {
 namespace {
 
 // The one message of the options, if they give one.
-std::optional<std::string> readMessage(const ExplainRequest& request, Given& given) {
+Fault readMessage(const ExplainRequest& request, Given& given) {
   if (!request.category && !request.type && request.payload.empty() && !request.payloadFile)
     return std::nullopt;
   if (!request.category || !request.type) return "a message needs --category and --type";
   GivenMessage message{*request.category, *request.type, request.flag, std::nullopt};
   if (request.payloadFile) {
-    auto payload = readDictionary(*request.payloadFile);
-    if (!payload) return payload.error();
-    message.payload = std::move(payload).value();
+    if (auto fault = taken(readDictionary(*request.payloadFile), message.payload)) return fault;
   }
   if (!request.payload.empty()) {
     const auto entries = tools::parseKeyValues(request.payload);
@@ -36,17 +34,11 @@ std::optional<std::string> readMessage(const ExplainRequest& request, Given& giv
   return std::nullopt;
 }
 
-std::optional<std::string> readFiles(const PlayedSession& session, Given& given) {
+Fault readFiles(const PlayedSession& session, Given& given) {
   if (session.device) {
-    auto device = readDevice(*session.device);
-    if (!device) return device.error();
-    given.device = std::move(device).value();
+    if (auto fault = taken(readDevice(*session.device), given.device)) return fault;
   }
-  if (!session.policy) return std::nullopt;
-  auto policy = readPolicy(*session.policy);
-  if (!policy) return policy.error();
-  given.policy = std::move(policy).value();
-  return std::nullopt;
+  return session.policy ? taken(readPolicy(*session.policy), given.policy) : std::nullopt;
 }
 
 }  // namespace
@@ -57,9 +49,8 @@ Outcome explain(const ExplainRequest& request) {
   Given given = request.session.given;
   if (const auto wrong = readFiles(request.session, given)) return {false, *wrong};
   if (request.session.messages) {
-    auto messages = readMessages(*request.session.messages);
-    if (!messages) return {false, messages.error()};
-    given.messages = std::move(messages).value();
+    if (const auto wrong = taken(readMessages(*request.session.messages), given.messages))
+      return {false, *wrong};
   }
   if (const auto wrong = readMessage(request, given)) return {false, *wrong};
   const Explanation told = explain(bag.value().storebag, given);

@@ -2,11 +2,15 @@
 // Counts the letters by which names differ.
 #include "storebag/spelling.h"
 
+#include <fmt/format.h>
+
 #include <algorithm>
 #include <numeric>
 #include <utility>
 
 #include "base/text.h"
+#include "storebag/lint_sink.h"
+#include "storebag/words.h"
 
 namespace veltrad::storebag {
 namespace {
@@ -52,6 +56,12 @@ std::optional<std::string> closestName(std::string_view given, const std::vector
     if (part.size() >= kFewestContained && whole.find(part) != std::string::npos) return candidate;
   }
   return std::nullopt;
+}
+
+std::string mostLike(std::string_view given, const std::vector<std::string>& known) {
+  const auto meant = closestName(given, known);
+  return meant ? fmt::format(": did you mean {}?", quoted(*meant))
+               : fmt::format(": expected one of {}", listed(known));
 }
 
 }  // namespace veltrad::storebag

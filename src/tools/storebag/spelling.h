@@ -13,5 +13,7 @@ namespace veltrad::storebag {
 // missing, added, wrong or exchanged with its neighbour; or if one of the two names contains the other.
 // Nothing: none is close.
 std::optional<std::string> closestName(std::string_view given, const std::vector<std::string>& known);
+// Follows a name that is not known: ": did you mean "phone"?", or ": expected one of lamp, phone".
+std::string mostLike(std::string_view given, const std::vector<std::string>& known);
 
 }  // namespace veltrad::storebag

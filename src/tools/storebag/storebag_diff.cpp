@@ -12,6 +12,7 @@
 #include "config/storebag_content.h"
 #include "config/storebag_section.h"
 #include "storebag/clients_diff.h"
+#include "storebag/entry_diff.h"
 #include "storebag/silence.h"
 #include "storebag/words.h"
 #include "wire/constants.h"
@@ -25,11 +26,6 @@ using config::Profile;
 using config::UploadProfile;
 using enum ChangeKind;
 using SharedProfile = std::shared_ptr<const Profile>;
-
-std::optional<Value> rawValue(const Dictionary* dictionary, const std::string& key) {
-  const Value* value = dictionary ? dictionary->find(key) : nullptr;
-  return value ? std::optional(*value) : std::nullopt;
-}
 
 template <typename Kind>
 const Kind* as(const SharedProfile& profile) {
@@ -84,7 +80,7 @@ class BackendDiff {
     else if (const auto* upload = as<UploadProfile>(current))
       compareUploads(*as<UploadProfile>(old), *upload);
     else if (as<HTTPSPostProfile>(current))
-      ClientsDiff(*_old->array("clients"), *_now->array("clients"), _at, _changes).compare();
+      compareClients(*_old->array("clients"), *_now->array("clients"), _at, _changes);
   }
 
  private:
@@ -96,20 +92,17 @@ class BackendDiff {
   // The energy log stays on the device.
   void sayBackend(const SharedProfile& profile, bool isNew) {
     const bool leaves = _name != wire::kVeltraBackendAmpery;
-    const auto value = [&](const Dictionary* content) {
+    const auto value = [](const Dictionary* content) {
       return content ? std::optional<Value>(*content) : std::nullopt;
     };
-    _sink.say(backend,
-              !leaves ? Effect::other
-              : isNew ? Effect::more
-                      : Effect::less,
-              std::nullopt, value(_old), value(_now),
+    const Effect effect = !leaves ? Effect::other : isNew ? Effect::more : Effect::less;
+    _sink.say(backend, effect, std::nullopt, value(_old), value(_now),
               isNew ? fmt::format("back end {} is new: {}", _name, purposeOf(profile, _name, "go"))
                     : fmt::format("back end {} is gone: {}", _name, purposeOf(profile, _name, "went")));
   }
 
   void sayAddress(const char* key, const std::string& what, Effect effect) {
-    const auto before = rawValue(_old, key), now = rawValue(_now, key);
+    const auto before = valueIn(_old, key), now = valueIn(_now, key);
     if (before == now) return;
     const auto shown = [](const std::optional<Value>& value) {
       return value ? value->toText().value_or("nothing") : std::string("nothing");
@@ -124,10 +117,10 @@ class BackendDiff {
     if (before.postURL != now.postURL)
       sayAddress("post_url", "log data", effectOfAddress(before.postURL, now.postURL));
     if (before.reliable == now.reliable) return;
-    _sink.say(batching, Effect::other, "reliable", rawValue(_old, "reliable"), rawValue(_now, "reliable"),
-              !now.reliable.on      ? "datagrams are no longer repeated until they are acknowledged"
-              : !before.reliable.on ? "datagrams are now repeated until they are acknowledged"
-                                    : "the pause before a datagram is repeated is another");
+    _sink.sayKey(batching, Effect::other, "reliable", _old, _now,
+                 !now.reliable.on      ? "datagrams are no longer repeated until they are acknowledged"
+                 : !before.reliable.on ? "datagrams are now repeated until they are acknowledged"
+                                       : "the pause before a datagram is repeated is another");
   }
 
   void compareUploads(const UploadProfile& before, const UploadProfile& now) {
@@ -161,7 +154,7 @@ void compareTop(const Dictionary& before, const Dictionary& now, std::vector<Cha
     return value ? value->toText().value_or("another") : std::string("none");
   };
   for (const char* key : {"version", "refresh_cycle", "serial", "expires", "name", "revoked"}) {
-    const auto old = rawValue(&before, key), current = rawValue(&now, key);
+    const auto old = valueIn(&before, key), current = valueIn(&now, key);
     if (old == current) continue;
     const bool isCycle = key == std::string_view("refresh_cycle");
     sink.say(isCycle ? refresh : version, Effect::other, key, old, current,

@@ -32,14 +32,6 @@ std::string numberOrNull(const std::optional<std::int32_t>& number) {
   return number ? std::to_string(*number) : "null";
 }
 
-std::string unknownBackend(const std::string& name) {
-  std::vector<std::string> known;
-  for (const config::Key& key : config::StorebagSection::kKeys) known.emplace_back(key.name);
-  const auto meant = closestName(name, known);
-  return fmt::format("unknown back end {}{}", quoted(name),
-                     meant ? ": did you mean " + quoted(*meant) + "?" : "");
-}
-
 // Compares one back end with what is expected of it.
 class Comparison {
  public:
@@ -174,11 +166,13 @@ class Suite {
     if (dictionary == nullptr) return "expected an object with state, reason, present, absent, hashed, equal";
     for (const auto& [key, value] : *dictionary) {
       const bool isList = key == "present" || key == "absent" || key == "hashed";
-      if (std::find(kExpectations.begin(), kExpectations.end(), key) == kExpectations.end()) {
-        const auto meant = closestName(key, kExpectations);
-        return fmt::format("unknown key {}{}", quoted(key),
-                           meant ? ": did you mean " + quoted(*meant) + "?" : "");
-      }
+      if (std::find(kExpectations.begin(), kExpectations.end(), key) == kExpectations.end())
+        return fmt::format("unknown key {}{}", quoted(key), mostLike(key, kExpectations));
+      const auto state = value.isNumber() ? value.toInt64() : std::nullopt;
+      if (key == "state" && (!state || *state < 0 || *state > 3))
+        return fmt::format("\"state\" is {}: expected an integer from 0 to 3, or null", shownValue(value));
+      if (key == "reason" && !value.asString())
+        return fmt::format("\"reason\" is {}: expected the name of a reason", shownValue(value));
       if (isList && !value.asArray())
         return fmt::format("\"{}\" is {}: expected an array of fields", key, shownValue(value));
       if (key == "equal" && !value.asDictionary())

@@ -2,33 +2,20 @@
 // Says what became of suites: for people, as JSON and for build servers.
 #include <fmt/format.h>
 
+#include <algorithm>
+
 #include "formats/json.h"
 #include "storebag/suite.h"
+#include "tools/markup.h"
 
 namespace veltrad::storebag {
 namespace {
 
-std::string escapedForXML(const std::string& text) {
-  std::string escaped;
-  for (const char c : text) {
-    switch (c) {
-      case '&':
-        escaped += "&amp;";
-        break;
-      case '<':
-        escaped += "&lt;";
-        break;
-      case '>':
-        escaped += "&gt;";
-        break;
-      case '"':
-        escaped += "&quot;";
-        break;
-      default:
-        escaped += static_cast<unsigned char>(c) < ' ' ? ' ' : c;
-    }
-  }
-  return escaped;
+// XML has no control characters.
+std::string escapedForXML(std::string text) {
+  std::replace_if(
+      text.begin(), text.end(), [](unsigned char c) { return c < ' '; }, ' ');
+  return tools::escapedForMarkup(text);
 }
 
 std::size_t failedCasesOf(const SuiteResult& suite) {

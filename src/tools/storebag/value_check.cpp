@@ -18,6 +18,7 @@ namespace {
 
 using config::Key;
 using config::KeyType;
+using enum FindingName;
 
 constexpr const char* kURL = "${url}";
 constexpr const char* kDashboardPort = "${dashboardPort}";
@@ -79,6 +80,160 @@ bool isCountry(const Key& key) {
   return key.name == std::string_view("locale_whitelist") || key.name == std::string_view("country");
 }
 
+class ValueCheck {
+ public:
+  // All outlive it.
+  ValueCheck(LintSink& sink, const Spot& at, const Key& key, const Value& value)
+      : _sink(sink), _at(at), _key(key), _value(value) {}
+
+  void check(bool lab) const {
+    const std::string* text = _value.asString();
+    if (lab && text && *text == kDashboardPort && _key.type == KeyType::integer) return;
+    if (!config::fits(_value, _key.type) || (_key.type == KeyType::integer && isFraction(_value)))
+      return say(wrong_type,
+                 fmt::format("\"{}\" is {}, not {}{}, and counts as absent", _key.name, shownValue(_value),
+                             typeText(_key.type), rangeText(_key)),
+                 mendOfType(_key, _value));
+    switch (_key.type) {
+      case KeyType::integer:
+      case KeyType::real:
+        return checkNumber();
+      case KeyType::presence:
+        return checkPresence();
+      case KeyType::names:
+        return checkNames();
+      case KeyType::texts:
+        return checkTexts(*_value.asArray());
+      case KeyType::url:
+        return checkAddress(*text, lab);
+      case KeyType::text:
+        return checkText(*text);
+      default:
+        return;
+    }
+  }
+
+ private:
+  void say(FindingName name, std::string message, std::string mend = {}) const {
+    _sink.say(name, _at, std::move(message), std::move(mend));
+  }
+
+  void checkNumber() const {
+    const config::Range& range = sensibleRange(_key);
+    const double number = _value.toDouble().value_or(0);
+    if (!isBounded(range) || (number >= range.least && number <= range.most)) return;
+    const std::string expected = typeText(_key.type) + rangeText(_key);
+    std::string mend = fmt::format("Write {}.", expected);
+    if (range.most == 1 && number > 1 && number <= 100)
+      mend = fmt::format("Write a share from 0 to 1: {:g} % is {:g}.", number, number / 100);
+    say(out_of_range, fmt::format("\"{}\" is {}: expected {}", _key.name, shownValue(_value), expected),
+        std::move(mend));
+  }
+
+  // Any value has an effect, but where numbers have a meaning, others are mistakes.
+  void checkPresence() const {
+    if (!isBounded(_key.range)) return;
+    const double least = sensibleRange(_key).least;
+    const std::string expected = fmt::format(
+        "Write the period in milliseconds, {:.0f} or more; without the key there is none.", least);
+    if (!_value.isNumber())
+      say(_value.isBoolean() ? out_of_range : wrong_type,
+          fmt::format("\"{}\" is {}, which switches it on with a period of 500 milliseconds", _key.name,
+                      shownValue(_value)),
+          _value.isBoolean() ? expected : mendOfType(_key, _value));
+    else if (_value.toDouble().value_or(0) < least)
+      say(out_of_range,
+          fmt::format("\"{}\" is {}: expected a number of milliseconds{}", _key.name, shownValue(_value),
+                      rangeText(_key)),
+          expected);
+  }
+
+  void checkNames() const {
+    std::vector<std::string> names;
+    config::take(_key, _value, names);
+    for (const std::string& name : names) checkName(name);
+  }
+
+  void checkTexts(const Array& texts) const {
+    for (const Value& item : texts) {
+      if (const std::string* text = item.asString())
+        checkName(*text);
+      else
+        say(wrong_type,
+            fmt::format("\"{}\" holds {}, which is no text and is passed over", _key.name, shownValue(item)),
+            "Take it out, or put it into quotes.");
+    }
+  }
+
+  // The name of a filtered field is compared whole, too.
+  void checkText(const std::string& text) const {
+    if (_key.name != std::string_view("key")) return;
+    const std::string_view bare = trimmed(text);
+    if (text.empty())
+      say(empty_in_list, "\"key\" is empty, and no field has such a name",
+          "Write the name of the field, or take the filter out.");
+    else if (bare != text)
+      say(blank_in_list,
+          fmt::format("\"key\" is {} with a blank, which is part of the name: the field leaves in clear",
+                      quoted(text)),
+          fmt::format("Write {}.", quoted(std::string(bare))));
+    else
+      checkWildcard(text);
+  }
+
+  void checkWildcard(const std::string& name) const {
+    if (name.find('*') != std::string::npos)
+      say(wildcard,
+          fmt::format("\"{}\" holds {}, which is compared letter by letter", _key.name, quoted(name)));
+  }
+
+  void checkName(const std::string& name) const {
+    if (name.empty()) return say(empty_in_list, fmt::format("\"{}\" holds an empty text", _key.name));
+    const std::string_view bare = trimmed(name);
+    const bool anywhere = isCountry(_key) && name.find(' ') != std::string::npos;
+    if (bare != name || anywhere)
+      return say(
+          blank_in_list,
+          fmt::format("\"{}\" holds {} with a blank, which is part of the name", _key.name, quoted(name)),
+          anywhere && bare == name ? "Put each country into quotes of its own: [\"US\", \"CA\"]."
+                                   : fmt::format("Write {}.", quoted(std::string(bare))));
+    if (isCountry(_key)) return checkCountry(name);
+    checkWildcard(name);
+  }
+
+  void checkCountry(const std::string& name) const {
+    const bool isThreshold = _key.name == std::string_view("country");
+    if (!fitsCountries(name, isThreshold))
+      return say(country_never_fits,
+                 fmt::format("\"{}\" holds {}, and no locale has such a country", _key.name, quoted(name)));
+    std::string capital = name;
+    for (char& c : capital)
+      if (c >= 'a' && c <= 'z') c = static_cast<char>(c - 'a' + 'A');
+    if (capital == name) return;
+    say(country_case,
+        fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", _key.name, quoted(name),
+                    isThreshold ? "this threshold is never used"
+                                : "here case does not matter, in \"country\" it does"),
+        fmt::format("Write {}.", quoted(capital)));
+  }
+
+  void checkAddress(const std::string& address, bool lab) const {
+    const bool hasPlaceholder = address.starts_with(kURL);
+    const auto fault = faultOfAddress(
+        lab && hasPlaceholder ? kStandIn + address.substr(std::string_view(kURL).size()) : address);
+    if (!fault) return;
+    say(fault->name, fmt::format("\"{}\" {} {}", _key.name, quoted(address), fault->what),
+        hasPlaceholder && !lab
+            ? "veltra-lab alone puts its address there: write that of your server, or give --lab."
+            : fault->mend);
+  }
+
+  LintSink& _sink;
+  const Spot& _at;
+  const Key& _key;
+  const Value& _value;
+};
+
 }  // namespace
 
 const char* typeText(KeyType type) {
@@ -100,163 +255,8 @@ std::string rangeText(const Key& key) {
   return range.least > config::kInt32.least ? fmt::format(" of at least {:.0f}", range.least) : "";
 }
 
-void ValueCheck::check(const Spot& at, const Key& key, const Value& value) const {
-  if (isPlaceholder(key, value)) return;
-  if (!config::fits(value, key.type) || (key.type == KeyType::integer && isFraction(value)))
-    return sayWrongType(at, key, value);
-  switch (key.type) {
-    case KeyType::integer:
-    case KeyType::real:
-      return checkNumber(at, key, value);
-    case KeyType::presence:
-      return checkPresence(at, key, value);
-    case KeyType::names:
-      return checkNames(at, key, *value.asString());
-    case KeyType::texts:
-      return checkTexts(at, key, *value.asArray());
-    case KeyType::url:
-      return checkAddress(at, key, *value.asString());
-    case KeyType::text:
-      return checkText(at, key, *value.asString());
-    default:
-      return;
-  }
-}
-
-bool ValueCheck::isPlaceholder(const Key& key, const Value& value) const {
-  const std::string* text = _lab ? value.asString() : nullptr;
-  return text != nullptr && *text == kDashboardPort && key.type == KeyType::integer;
-}
-
-void ValueCheck::sayWrongType(const Spot& at, const Key& key, const Value& value) const {
-  _sink.say(FindingName::wrong_type, at,
-            fmt::format("\"{}\" is {}, not {}{}, and counts as absent", key.name, shownValue(value),
-                        typeText(key.type), rangeText(key)),
-            mendOfType(key, value));
-}
-
-void ValueCheck::sayNoDictionary(const Spot& at, const Value& value) const {
-  _sink.say(FindingName::wrong_type, at,
-            fmt::format("{} is no dictionary, and is passed over", shownValue(value)),
-            "Take it out, or put a dictionary there.");
-}
-
-void ValueCheck::checkNumber(const Spot& at, const Key& key, const Value& value) const {
-  const config::Range& range = sensibleRange(key);
-  const double number = value.toDouble().value_or(0);
-  if (!isBounded(range) || (number >= range.least && number <= range.most)) return;
-  std::string mend = fmt::format("Write {}{}.", typeText(key.type), rangeText(key));
-  if (range.most == 1 && number > 1 && number <= 100)
-    mend = fmt::format("Write a share from 0 to 1: {:g} % is {:g}.", number, number / 100);
-  _sink.say(FindingName::out_of_range, at,
-            fmt::format("\"{}\" is {}: expected {}{}", key.name, shownValue(value), typeText(key.type),
-                        rangeText(key)),
-            std::move(mend));
-}
-
-// Any value has an effect, but where numbers have a meaning, others are mistakes.
-void ValueCheck::checkPresence(const Spot& at, const Key& key, const Value& value) const {
-  if (!isBounded(key.range)) return;
-  const std::string expected =
-      fmt::format("Write the period in milliseconds, {:.0f} or more; without the key there is none.",
-                  sensibleRange(key).least);
-  if (value.isBoolean())
-    return _sink.say(FindingName::out_of_range, at,
-                     fmt::format("\"{}\" is {}, which switches it on with a period of 500 milliseconds",
-                                 key.name, shownValue(value)),
-                     expected);
-  if (!value.isNumber())
-    return _sink.say(FindingName::wrong_type, at,
-                     fmt::format("\"{}\" is {}, which switches it on with a period of 500 milliseconds",
-                                 key.name, shownValue(value)),
-                     mendOfType(key, value));
-  if (value.toDouble().value_or(0) < sensibleRange(key).least)
-    _sink.say(FindingName::out_of_range, at,
-              fmt::format("\"{}\" is {}: expected a number of milliseconds{}", key.name, shownValue(value),
-                          rangeText(key)),
-              expected);
-}
-
-void ValueCheck::checkNames(const Spot& at, const Key& key, const std::string& text) const {
-  std::vector<std::string> names;
-  config::take(key, Value(text), names);
-  for (const std::string& name : names) checkName(at, key, name);
-}
-
-void ValueCheck::checkTexts(const Spot& at, const Key& key, const Array& texts) const {
-  for (const Value& item : texts) {
-    const std::string* text = item.asString();
-    if (text != nullptr) {
-      checkName(at, key, *text);
-    } else {
-      _sink.say(
-          FindingName::wrong_type, at,
-          fmt::format("\"{}\" holds {}, which is no text and is passed over", key.name, shownValue(item)),
-          "Take it out, or put it into quotes.");
-    }
-  }
-}
-
-// The name of a filtered field is compared whole, too.
-void ValueCheck::checkText(const Spot& at, const Key& key, const std::string& text) const {
-  if (key.name != std::string_view("key")) return;
-  const std::string_view bare = trimmed(text);
-  if (text.empty())
-    _sink.say(FindingName::empty_in_list, at, "\"key\" is empty, and no field has such a name",
-              "Write the name of the field, or take the filter out.");
-  else if (bare != text)
-    _sink.say(FindingName::blank_in_list, at,
-              fmt::format("\"key\" is {} with a blank, which is part of the name: the field leaves in clear",
-                          quoted(text)),
-              fmt::format("Write {}.", quoted(std::string(bare))));
-  else
-    checkWildcard(at, key, text);
-}
-
-void ValueCheck::checkWildcard(const Spot& at, const Key& key, const std::string& name) const {
-  if (name.find('*') != std::string::npos)
-    _sink.say(FindingName::wildcard, at,
-              fmt::format("\"{}\" holds {}, which is compared letter by letter", key.name, quoted(name)));
-}
-
-void ValueCheck::checkName(const Spot& at, const Key& key, const std::string& name) const {
-  if (name.empty())
-    return _sink.say(FindingName::empty_in_list, at, fmt::format("\"{}\" holds an empty text", key.name));
-  const std::string_view bare = trimmed(name);
-  const bool anywhere = isCountry(key) && name.find(' ') != std::string::npos;
-  if (bare != name || anywhere)
-    return _sink.say(
-        FindingName::blank_in_list, at,
-        fmt::format("\"{}\" holds {} with a blank, which is part of the name", key.name, quoted(name)),
-        anywhere && bare == name ? "Put each country into quotes of its own: [\"US\", \"CA\"]."
-                                 : fmt::format("Write {}.", quoted(std::string(bare))));
-  if (!isCountry(key)) return checkWildcard(at, key, name);
-  const bool isThreshold = key.name == std::string_view("country");
-  if (!fitsCountries(name, isThreshold))
-    return _sink.say(
-        FindingName::country_never_fits, at,
-        fmt::format("\"{}\" holds {}, and no locale has such a country", key.name, quoted(name)));
-  const bool hasSmall = std::any_of(name.begin(), name.end(), [](char c) { return c >= 'a' && c <= 'z'; });
-  if (!hasSmall) return;
-  std::string capital = name;
-  for (char& c : capital)
-    if (c >= 'a' && c <= 'z') c = static_cast<char>(c - 'a' + 'A');
-  _sink.say(FindingName::country_case, at,
-            fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", key.name, quoted(name),
-                        isThreshold ? "this threshold is never used"
-                                    : "here case does not matter, in \"country\" it does"),
-            fmt::format("Write {}.", quoted(std::as_const(capital))));
-}
-
-void ValueCheck::checkAddress(const Spot& at, const Key& key, const std::string& address) const {
-  const bool hasPlaceholder = address.starts_with(kURL);
-  const auto fault = faultOfAddress(
-      _lab && hasPlaceholder ? kStandIn + address.substr(std::string_view(kURL).size()) : address);
-  if (!fault) return;
-  _sink.say(fault->name, at, fmt::format("\"{}\" {} {}", key.name, quoted(address), fault->what),
-            hasPlaceholder && !_lab
-                ? "veltra-lab alone puts its address there: write that of your server, or give --lab."
-                : fault->mend);
+void checkValue(LintSink& sink, bool lab, const Spot& at, const Key& key, const Value& value) {
+  ValueCheck(sink, at, key, value).check(lab);
 }
 
 }  // namespace veltrad::storebag

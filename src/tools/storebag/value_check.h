@@ -9,31 +9,8 @@
 
 namespace veltrad::storebag {
 
-class ValueCheck {
- public:
-  // `lab`: as in LintOptions. The sink outlives it.
-  ValueCheck(LintSink& sink, bool lab) : _sink(sink), _lab(lab) {}
-
-  // `at` is the key's.
-  void check(const Spot& at, const config::Key& key, const Value& value) const;
-  // Of an array where a dictionary should stand.
-  void sayNoDictionary(const Spot& at, const Value& value) const;
-
- private:
-  bool isPlaceholder(const config::Key& key, const Value& value) const;
-  void sayWrongType(const Spot& at, const config::Key& key, const Value& value) const;
-  void checkNumber(const Spot& at, const config::Key& key, const Value& value) const;
-  void checkPresence(const Spot& at, const config::Key& key, const Value& value) const;
-  void checkNames(const Spot& at, const config::Key& key, const std::string& text) const;
-  void checkTexts(const Spot& at, const config::Key& key, const Array& texts) const;
-  void checkText(const Spot& at, const config::Key& key, const std::string& text) const;
-  void checkWildcard(const Spot& at, const config::Key& key, const std::string& name) const;
-  void checkName(const Spot& at, const config::Key& key, const std::string& name) const;
-  void checkAddress(const Spot& at, const config::Key& key, const std::string& address) const;
-
-  LintSink& _sink;
-  const bool _lab;
-};
+// `at` is the key's. `lab`: as in LintOptions.
+void checkValue(LintSink& sink, bool lab, const Spot& at, const config::Key& key, const Value& value);
 
 // What a value of this type is: "a text".
 const char* typeText(config::KeyType type);

@@ -7,15 +7,19 @@
 
 #include "base/value.h"
 
-namespace veltrad::storebag {
+namespace veltrad::tools {
 
-inline Value unknownValue() {
+inline Value nullValue() {
   return std::numeric_limits<double>::quiet_NaN();
 }
 
 template <typename T>
 Value orNull(const std::optional<T>& value) {
-  return value ? Value(*value) : unknownValue();
+  return value ? Value(*value) : nullValue();
 }
 
-}  // namespace veltrad::storebag
+inline Value orNull(const Value* value) {
+  return value ? *value : nullValue();
+}
+
+}  // namespace veltrad::tools
