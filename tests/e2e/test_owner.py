@@ -174,6 +174,9 @@ class Owner(OwnerTest):
             left = {line["to"]: line for line in self.privacy()["destinations"]}
             self.assertEqual([left[url][key] for key in ("events", "files", "logData")], [6, 2, 1])
             page = self.root.path / "page.html"
+            full = subprocess.run(["sh", "-c", 'trap "" XFSZ; ulimit -f 1; exec "$@"', "sh", program("veltractl"), "--root", str(self.root.path),
+                                   "history", "--html", str(page)], capture_output=True, text=True)
+            self.assertEqual((full.returncode, full.stderr, page.exists()), (1, f"veltractl: {page}: File too large\n", False))
             self.ctl("history", "--html", str(page))
             self.assertEqual(stat.S_IMODE(page.stat().st_mode), 0o600)
             self.assertEqual(page.read_text().count('<details class="item"'), len(items) + 1)

@@ -21,4 +21,11 @@ const Array& arrayIn(const Dictionary& answer, const char* key) {
   return array ? *array : kNone;
 }
 
+std::vector<const Dictionary*> dictionariesIn(const Dictionary& answer, const char* key) {
+  std::vector<const Dictionary*> dictionaries;
+  for (const Value& element : arrayIn(answer, key))
+    if (const Dictionary* dictionary = element.asDictionary()) dictionaries.push_back(dictionary);
+  return dictionaries;
+}
+
 }  // namespace veltrad::ctl

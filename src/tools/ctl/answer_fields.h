@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 #include "base/value.h"
 
@@ -13,5 +14,7 @@ namespace veltrad::ctl {
 std::string textIn(const Dictionary& answer, const char* key, const char* otherwise = "");
 std::int64_t numberIn(const Dictionary& answer, const char* key);
 const Array& arrayIn(const Dictionary& answer, const char* key);
+// The dictionaries in an array.
+std::vector<const Dictionary*> dictionariesIn(const Dictionary& answer, const char* key);
 
 }  // namespace veltrad::ctl

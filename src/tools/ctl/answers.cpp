@@ -20,7 +20,7 @@ std::string jsonString(std::string_view text) {
 }
 
 template <typename T>
-std::string orNull(const std::optional<T>& value) {
+std::string jsonOrNull(const std::optional<T>& value) {
   return value ? formats::writeJSON(Value(*value)) : "null";
 }
 
@@ -53,14 +53,14 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
     case Operation::start:
     case Operation::restart:
     case Operation::states:
-      text += ",\"backends\":" + orNull(answer.backends);
+      text += ",\"backends\":" + jsonOrNull(answer.backends);
       break;
     case Operation::send:
     case Operation::oneShot:
     case Operation::flush:
     case Operation::displayURL:
     case Operation::finish:
-      text += ",\"reply\":" + orNull(answer.reply);
+      text += ",\"reply\":" + jsonOrNull(answer.reply);
       break;
     case Operation::uploadFile:
     case Operation::uploadLogData:
@@ -77,7 +77,7 @@ std::string formatAnswer(Operation operation, const Answer& answer) {
 std::string formatSent(const Answer& answer) {
   std::string text = formatAnswer(Operation::send, answer);
   text.pop_back();
-  return text + ",\"outcomes\":" + orNull(answer.outcomes) + '}';
+  return text + ",\"outcomes\":" + jsonOrNull(answer.outcomes) + '}';
 }
 
 std::vector<std::string> outcomeLines(const Answer& answer) {
@@ -104,8 +104,8 @@ bool reported(const Answer& answer) {
 std::string formatAggregated(const AggregatedCopy& copy) {
   return fmt::format(
       R"({{"op":"aggregated","sessionInfo":{},"timestamp":{},"category":{},"type":{},"payload":{}}})",
-      orNull(copy.sessionInfo), formats::writeJSON(copy.timestamp), copy.category, copy.type,
-      orNull(copy.payload));
+      jsonOrNull(copy.sessionInfo), formats::writeJSON(copy.timestamp), copy.category, copy.type,
+      jsonOrNull(copy.payload));
 }
 
 std::string formatMalformedLine(std::uint64_t line, std::string_view description) {

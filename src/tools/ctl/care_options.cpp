@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The commands of veltractl for those who look after a device.
-#include "tools/ctl/care_options.h"
+#include "tools/ctl/command_options.h"
 
 #include <fmt/format.h>
 
@@ -9,25 +9,25 @@
 #include <vector>
 
 #include "base/text.h"
-#include "tools/ctl/fate_options.h"
 
 namespace veltrad::ctl {
 
+// The callbacks of its own commands run before.
 CLI::App* addCommand(CLI::App& app, Options& options, Command command, const std::string& name,
-                     const std::string& help) {
-  CLI::App* added = app.add_subcommand(name, help)->group("Commands");
-  added->final_callback([&options, command] { options.command = command; });
+                     const std::string& help, const char* group) {
+  CLI::App* added = app.add_subcommand(name, help)->group(group);
+  added->final_callback([&options, command, added] {
+    if (added->get_subcommands().empty()) options.command = command;
+  });
   return added;
 }
 
 namespace {
 
-constexpr const char* kCareGroup = "Looking after a device";
-
 void addDoctor(CLI::App& app, Options& options) {
-  CLI::App* doctor = addCommand(app, options, Command::doctor, "doctor",
-                                "Check everything that stands between this device and its first report")
-                         ->group(kCareGroup);
+  CLI::App* doctor =
+      addCommand(app, options, Command::doctor, "doctor",
+                 "Check everything that stands between this device and its first report", kCareGroup);
   const auto add = [&options](const std::string& text) {
     std::int32_t type = 0;
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), type);
@@ -56,12 +56,7 @@ void addDoctor(CLI::App& app, Options& options) {
 void addConfig(CLI::App& app, Options& options) {
   Care& care = options.care;
   CLI::App* config = addCommand(app, options, Command::config, "config",
-                                "Show or change the preferences that the system reads")
-                         ->group(kCareGroup);
-  // A command's callback runs before that of the command which it belongs to.
-  config->final_callback([&options, config] {
-    if (config->get_subcommands().empty()) options.command = Command::config;
-  });
+                                "Show or change the preferences that the system reads", kCareGroup);
   config->require_subcommand(0, 1);
   const auto addKey = [&](CLI::App* command) {
     command->add_option("key", care.key, "Name of a preference, as `veltractl config` shows it")
@@ -85,9 +80,8 @@ void addConfig(CLI::App& app, Options& options) {
 }
 
 void addRefreshAndReport(CLI::App& app, Options& options) {
-  CLI::App* refresh =
-      addCommand(app, options, Command::refresh, "refresh", "Fetch storebags now and say what came of it")
-          ->group(kCareGroup);
+  CLI::App* refresh = addCommand(app, options, Command::refresh, "refresh",
+                                 "Fetch storebags now and say what came of it", kCareGroup);
   refresh
       ->add_option("name", options.care.key,
                    "A storebag; without it those asked for since the start, else all")
@@ -97,8 +91,7 @@ void addRefreshAndReport(CLI::App& app, Options& options) {
       "status is 1 if a storebag was not fetched.\n\nExamples:\n  veltractl refresh\n"
       "  veltractl refresh quindle --json");
   CLI::App* report = addCommand(app, options, Command::report, "report",
-                                "Print all that helps to find a fault, to be passed on")
-                         ->group(kCareGroup);
+                                "Print all that helps to find a fault, to be passed on", kCareGroup);
   report->add_option("-o,--output", options.care.output, "Also write it to FILE, a new one, mode 0600")
       ->type_name("FILE");
   report->add_flag("--yes", options.care.yes, "Write it without a question");
@@ -112,11 +105,7 @@ void addRefreshAndReport(CLI::App& app, Options& options) {
 
 void addSpool(CLI::App& app, Options& options) {
   CLI::App* spool = addCommand(app, options, Command::spool, "spool",
-                               "Show the posts that failed and are kept to be sent again")
-                        ->group(kCareGroup);
-  spool->final_callback([&options, spool] {
-    if (spool->get_subcommands().empty()) options.command = Command::spool;
-  });
+                               "Show the posts that failed and are kept to be sent again", kCareGroup);
   spool->require_subcommand(0, 1);
   addCommand(*spool, options, Command::spool, "list", "The same as without a command");
   addCommand(*spool, options, Command::spoolSend, "send",
@@ -134,12 +123,11 @@ void addSpool(CLI::App& app, Options& options) {
 
 void addCare(CLI::App& app, Options& options) {
   CLI::App* status = addCommand(app, options, Command::status, "status",
-                                "Show the running daemon, its sessions, storebags and servers")
-                         ->group(kCareGroup);
+                                "Show the running daemon, its sessions, storebags and servers", kCareGroup);
   status->add_flag("--watch", options.care.watch, "Show it anew every second, until interrupted");
   status->footer("Examples:\n  veltractl status --watch\n  veltractl status --json");
-  addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text")
-      ->group(kCareGroup)
+  addCommand(app, options, Command::metrics, "metrics", "Print the daemon's metrics as OpenMetrics text",
+             kCareGroup)
       ->footer("The daemon keeps the same text in run/veltrad/metrics.prom.");
   addFates(app, options);
   addConfig(app, options);
@@ -147,8 +135,7 @@ void addCare(CLI::App& app, Options& options) {
   addSpool(app, options);
   addDoctor(app, options);
   CLI::App* stats = addCommand(app, options, Command::stats, "stats",
-                               "Show what happened to messages, by reason, with counts")
-                        ->group(kCareGroup);
+                               "Show what happened to messages, by reason, with counts", kCareGroup);
   stats->footer("Examples:\n  veltractl stats\n  veltractl stats --json");
 }
 

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Keys and values are judged here before anybody is asked, so that wrong usage is told apart.
-#include "tools/ctl/config_command.h"
+// `veltractl config`. Keys and values are judged here before anybody is asked, so that wrong usage is told
+// apart.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -9,6 +10,7 @@
 #include "base/text.h"
 #include "config/preference_keys.h"
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/preference_access.h"
 #include "tools/ctl/print.h"
 #include "wire/names.h"
@@ -33,6 +35,11 @@ std::string words(const Value& value) {
   return escapedForLog(text ? *text : formats::writeJSON(value));
 }
 
+const char* whenSeen(const PreferenceKey& key) {
+  const bool now = key.effect == PreferenceKey::Effect::now;
+  return now ? "for sessions that start from now on" : "at the next start";
+}
+
 Result<Dictionary, std::string> askedFor(const Options& options, Use use, const char* question,
                                          const Dictionary& arguments) {
   auto access = PreferenceAccess::open(options.root, use);
@@ -44,20 +51,18 @@ int list(const Options& options) {
   const auto answer = askedFor(options, Use::read, wire::question::kConfig, {});
   if (!answer) return refused(answer.error());
   const Dictionary& keys = answer.value();
-  return printLine(options.json ? formats::writeJSON(keys) : formatPreferences(keys)) ? 0 : 1;
+  return printed(options.json ? formats::writeJSON(keys) : formatPreferences(keys));
 }
 
 int get(const Options& options, const PreferenceKey& key) {
   const auto answer = askedFor(options, Use::read, wire::question::kConfig, {});
   if (!answer) return refused(answer.error());
-  const Array* keys = answer.value().array("keys");
-  for (const Value& one : keys ? *keys : Array()) {
-    const Dictionary* found = one.asDictionary();
-    const std::string* name = found ? found->string("name") : nullptr;
+  for (const Dictionary* found : dictionariesIn(answer.value(), "keys")) {
+    const std::string* name = found->string("name");
     if (!name || *name != key.name()) continue;
     const auto value = setValue(*found);
     if (!value) break;
-    return printLine(options.json ? formats::writeJSON(*value) : words(*value)) ? 0 : 1;
+    return printed(options.json ? formats::writeJSON(*value) : words(*value));
   }
   return refused(fmt::format("{} is not set; default: {}", key.name(), key.byDefault));
 }
@@ -70,37 +75,26 @@ int set(const Options& options, const PreferenceKey& key) {
       askedFor(options, Use::change, wire::question::kSetConfig, {{"name", key.name()}, {"value", text}});
   if (!answer) return refused(answer.error());
   if (options.json)
-    return printLine(formats::writeJSON(Dictionary{{"name", key.name()}, {"value", value.value()}})) ? 0 : 1;
-  const bool now = key.effect == PreferenceKey::Effect::now;
-  return printLine(fmt::format("{} = {}: takes effect {}", key.name(), words(value.value()),
-                               now ? "for sessions that start from now on" : "at the next start"))
-             ? 0
-             : 1;
+    return printed(formats::writeJSON(Dictionary{{"name", key.name()}, {"value", value.value()}}));
+  return printed(fmt::format("{} = {}: takes effect {}", key.name(), words(value.value()), whenSeen(key)));
 }
 
 int unset(const Options& options, const PreferenceKey& key) {
   const auto answer = askedFor(options, Use::change, wire::question::kUnsetConfig, {{"name", key.name()}});
   if (!answer) return refused(answer.error());
   const bool wasSet = answer.value().boolean("wasSet").value_or(true);
-  if (options.json)
-    return printLine(formats::writeJSON(Dictionary{{"name", key.name()}, {"wasSet", wasSet}})) ? 0 : 1;
-  if (!wasSet) return printLine(fmt::format("{} was not set", key.name())) ? 0 : 1;
-  const bool now = key.effect == PreferenceKey::Effect::now;
-  return printLine(fmt::format("{} is not set any more, default: {}: takes effect {}", key.name(),
-                               key.byDefault,
-                               now ? "for sessions that start from now on" : "at the next start"))
-             ? 0
-             : 1;
+  if (options.json) return printed(formats::writeJSON(Dictionary{{"name", key.name()}, {"wasSet", wasSet}}));
+  if (!wasSet) return printed(fmt::format("{} was not set", key.name()));
+  return printed(fmt::format("{} is not set any more, default: {}: takes effect {}", key.name(),
+                             key.byDefault, whenSeen(key)));
 }
 
 }  // namespace
 
 std::string formatPreferences(const Dictionary& answer) {
   std::string out;
-  const Array* keys = answer.array("keys");
-  for (const Value& one : keys ? *keys : Array()) {
-    const Dictionary* listed = one.asDictionary();
-    const std::string* name = listed ? listed->string("name") : nullptr;
+  for (const Dictionary* listed : dictionariesIn(answer, "keys")) {
+    const std::string* name = listed->string("name");
     const PreferenceKey* key = name ? config::preferenceNamed(*name) : nullptr;
     if (!name) continue;
     const auto value = setValue(*listed);

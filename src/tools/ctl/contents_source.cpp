@@ -5,6 +5,7 @@
 #include <algorithm>
 
 #include "base/property_list.h"
+#include "tools/ctl/answer_fields.h"
 #include "wire/limits.h"
 #include "wire/names.h"
 
@@ -12,8 +13,7 @@ namespace veltrad::ctl {
 
 namespace {
 std::uint64_t unsignedNumber(const Dictionary& answer, const char* key) {
-  const Value* value = answer.find(key);
-  return static_cast<std::uint64_t>(value ? value->toInt64().value_or(0) : 0);
+  return static_cast<std::uint64_t>(numberIn(answer, key));
 }
 }  // namespace
 
@@ -24,11 +24,8 @@ Result<Done, std::string> ContentsSource::readOn() {
     if (_next) arguments.set("from", *_next);
     const auto answer = _daemon.ask(wire::question::kContents, std::move(arguments));
     if (!answer) return Failure{answer.error()};
-    const Array* pieces = answer.value().array("contents");
-    if (!pieces) return Failure{std::string("veltrad answered without contents.")};
-    for (const Value& piece : *pieces) {
-      if (const Dictionary* one = piece.asDictionary()) take(*one);
-    }
+    if (!answer.value().array("contents")) return Failure{std::string("veltrad answered without contents.")};
+    for (const Dictionary* piece : dictionariesIn(answer.value(), "contents")) take(*piece);
     _next = unsignedNumber(answer.value(), "next");
     if (!end) end = unsignedNumber(answer.value(), "end");
   }

@@ -1,16 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
-// The daemon decides all checks but the first, which is whether it can be asked.
-#include "tools/ctl/doctor_command.h"
+// `veltractl doctor`. The daemon decides all checks but the first, which is whether it can be asked.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
 #include <algorithm>
 #include <iterator>
+#include <vector>
 
 #include "client/daemon_socket.h"
 #include "formats/json.h"
 #include "tools/ctl/answer_fields.h"
-#include "tools/ctl/control_client.h"
 #include "tools/ctl/print.h"
 #include "wire/constants.h"
 #include "wire/names.h"
@@ -80,11 +80,9 @@ Array askForChecks(const Options& options) {
   return checks;
 }
 
-std::string formatChecks(const Array& checks) {
+std::string formatChecks(const std::vector<const Dictionary*>& checks) {
   std::string all;
-  for (const Value& value : checks) {
-    const Dictionary* check = value.asDictionary();
-    if (!check) continue;
+  for (const Dictionary* check : checks) {
     if (!all.empty()) all += '\n';
     all += fmt::format("{:<8}{:<17}{}", textIn(*check, "result"), textIn(*check, "name"),
                        textIn(*check, "text"));
@@ -97,15 +95,14 @@ std::string formatChecks(const Array& checks) {
 }  // namespace
 
 int runDoctor(const Options& options) {
-  Array checks = askForChecks(options);
-  const bool failed = std::any_of(checks.begin(), checks.end(), [](const Value& value) {
-    const Dictionary* check = value.asDictionary();
-    return check && textIn(*check, "result") == "failure";
+  Dictionary report{{"checks", askForChecks(options)}};
+  const auto checks = dictionariesIn(report, "checks");
+  const bool failed = std::any_of(checks.begin(), checks.end(), [](const Dictionary* check) {
+    return textIn(*check, "result") == "failure";
   });
-  const bool printed =
-      options.json ? printLine(formats::writeJSON(Dictionary{{"ok", !failed}, {"checks", std::move(checks)}}))
-                   : printLine(formatChecks(checks));
-  return failed || !printed ? 1 : 0;
+  if (!options.json) return printed(formatChecks(checks)) == 0 && !failed ? 0 : 1;
+  report.set("ok", !failed);
+  return printed(formats::writeJSON(report)) == 0 && !failed ? 0 : 1;
 }
 
 }  // namespace veltrad::ctl

@@ -2,16 +2,14 @@
 // Makes the JSON of `veltractl why` and `watch`.
 #include "tools/ctl/fate_lines.h"
 
-#include <cmath>
-#include <limits>
+#include "tools/null_value.h"
 
 namespace veltrad::ctl {
 
 namespace {
-template <typename T>
-Value valueOrNull(const std::optional<T>& value) {
-  return value ? Value(*value) : nullValue();
-}
+
+using tools::nullValue;
+using tools::orNull;
 
 template <typename T>
 Value valueIfKnown(std::uint8_t known, std::uint8_t which, T value) {
@@ -52,10 +50,10 @@ Dictionary lineOfBackend(const support::BackendFate& fate, const std::vector<sup
                   {"hashed", arrayOf(fate.hashed)},
                   {"batch", numberOrNull(fate.batch)},
                   {"post", numberOrNull(fate.post)},
-                  {"url", valueOrNull(fate.url)},
+                  {"url", orNull(fate.url)},
                   {"bytes", numberOrNull(fate.bytes)},
                   {"events", numberOrNull(fate.events)},
-                  {"status", valueOrNull(fate.status)},
+                  {"status", orNull(fate.status)},
                   {"transmissions", fate.transmissions},
                   {"road", std::move(road)}};
   if (!fate.standing) {
@@ -77,10 +75,6 @@ Dictionary lineOfBackend(const support::BackendFate& fate, const std::vector<sup
   return line;
 }
 }  // namespace
-
-Value nullValue() {
-  return std::numeric_limits<double>::quiet_NaN();
-}
 
 double secondsOf(std::int64_t time) {
   return static_cast<double>(time) / 1e6;
@@ -114,22 +108,22 @@ Dictionary lineOfMessage(const support::ToldMessage& message) {
       {"message", entry.message & ~wire::kNoMessage},
       {"time", secondsOf(entry.time)},
       {"from", kFrom[static_cast<std::size_t>(entry.from)]},
-      {"session", valueOrNull(session.session)},
+      {"session", orNull(session.session)},
       {"clientType", valueIfKnown(of.known, Session::clientTypeKnown, of.clientType)},
       {"sessionID", valueIfKnown(of.known, Session::sessionIDKnown, of.sessionID)},
       {"clientVersion", valueIfKnown(of.known, Session::clientVersionKnown, unsigned{of.clientVersion})},
-      {"client", valueOrNull(session.client)},
-      {"service", valueOrNull(session.service)},
+      {"client", orNull(session.client)},
+      {"service", orNull(session.service)},
       {"category", valueIfKnown(entry.known, Message::categoryKnown, unsigned{entry.category})},
       {"type", valueIfKnown(entry.known, Message::typeKnown, unsigned{entry.type})},
       {"flag", entry.flag},
-      {"aggregatedTo", valueOrNull(message.aggregatedTo)},
+      {"aggregatedTo", orNull(message.aggregatedTo)},
       {"reason", reasonOrNull(wire::reasonIn(entry.reason))},
       {"storebag", nullValue()}};
   if (session.storebag) {
     line.set("storebag", Dictionary{{"name", *session.storebag},
-                                    {"version", valueOrNull(session.version)},
-                                    {"section", valueOrNull(session.section)}});
+                                    {"version", orNull(session.version)},
+                                    {"section", orNull(session.section)}});
   }
   if (entry.item != Message::Item::message) line.set("kind", kItems[static_cast<std::size_t>(entry.item)]);
   return line;

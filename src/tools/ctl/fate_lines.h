@@ -13,8 +13,6 @@ Dictionary lineOfMessage(const support::ToldMessage& message);
 Dictionary lineOfFates(const support::MessageFates& fates);
 // "time", "step" and what else is known of a step.
 Dictionary lineOfStep(const support::ToldStep& step);
-// Printed as null.
-Value nullValue();
 // Seconds since 1970.
 double secondsOf(std::int64_t time);
 

@@ -1,10 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // Which messages are asked for.
-#include "tools/ctl/fate_options.h"
+#include "tools/ctl/command_options.h"
 
 #include <CLI/CLI.hpp>
 
-#include "tools/ctl/care_options.h"
 #include "tools/ctl/number_option.h"
 #include "wire/fates.h"
 
@@ -41,9 +40,8 @@ void addFilters(CLI::App& command, FateFilter& filter) {
 }  // namespace
 
 void addFates(CLI::App& app, Options& options) {
-  constexpr const char* kCare = "Looking after a device";
   CLI::App* why =
-      addCommand(app, options, Command::why, "why", "Tell what became of messages, and why")->group(kCare);
+      addCommand(app, options, Command::why, "why", "Tell what became of messages, and why", kCareGroup);
   addFilters(*why, options.care.fates);
   addNumber(*why, "--last", options.care.last, "At most so many, the newest that fit; 20 without it");
   why->footer(
@@ -54,9 +52,8 @@ void addFates(CLI::App& app, Options& options) {
       "values of fields, only the names of those that were removed or hashed.\n\n"
       "Examples:\n  veltractl why --client lamp --last 3\n  veltractl why --category 5 --backend httppost "
       "--json");
-  CLI::App* watch =
-      addCommand(app, options, Command::watch, "watch", "Tell the same as it happens, until interrupted")
-          ->group(kCare);
+  CLI::App* watch = addCommand(app, options, Command::watch, "watch",
+                               "Tell the same as it happens, until interrupted", kCareGroup);
   addFilters(*watch, options.care.fates);
   watch->add_flag("--contents", options.care.contents,
                   "Also what the messages hold, which needs \"control\"");

@@ -2,7 +2,6 @@
 // Takes the entries out of the daemon's answers.
 #include "tools/ctl/fate_source.h"
 
-#include <algorithm>
 #include <cstring>
 
 #include "tools/ctl/answer_fields.h"

@@ -2,9 +2,10 @@
 // Asks for page after page, and joins the two records of what left.
 #include "tools/ctl/history_client.h"
 
-#include <limits>
 #include <map>
 
+#include "tools/ctl/answer_fields.h"
+#include "tools/null_value.h"
 #include "wire/names.h"
 
 namespace veltrad::ctl {
@@ -17,25 +18,19 @@ constexpr const char* kKeys[] = {"id",      "time",       "kind",      "to",    
                                  "backend", "storebag",   "entry",     "removed", "hashed"};
 constexpr const char* kEndKeys[] = {"status", "error", "transmissions"};
 
-Value fieldOrNull(const Dictionary& from, const char* key) {
-  const Value* value = from.find(key);
-  return value ? *value : Value(std::numeric_limits<double>::quiet_NaN());
-}
-
 HistoryItem itemOf(const Dictionary& record) {
   HistoryItem item;
-  for (const char* key : kKeys) item.facts.set(key, fieldOrNull(record, key));
-  for (const char* key : {"status", "error"}) item.facts.set(key, fieldOrNull({}, key));
+  for (const char* key : kKeys) item.facts.set(key, tools::orNull(record.find(key)));
+  for (const char* key : {"status", "error"}) item.facts.set(key, tools::nullValue());
   item.facts.set("transmissions", 1);
-  const Array* headers = record.array("headers");
-  if (headers) item.headers = *headers;
-  item.day = fieldOrNull(record, "day");
-  item.offset = fieldOrNull(record, "offset");
+  item.headers = arrayIn(record, "headers");
+  item.day = tools::orNull(record.find("day"));
+  item.offset = tools::orNull(record.find("offset"));
   const std::string* digest = record.string("sha256");
   if (digest) item.digest = *digest;
   if (!record.boolean("kept").value_or(true)) {
     item.facts.set("kept", false);
-    item.facts.set("sha256", fieldOrNull(record, "sha256"));
+    item.facts.set("sha256", tools::orNull(record.find("sha256")));
     if (!digest) item.digest = "unknown";
   }
   return item;
@@ -55,16 +50,15 @@ Result<std::vector<HistoryItem>, std::string> askForHistory(ControlClient& daemo
   do {
     auto page = daemon.ask(wire::question::kHistory, next, kHistoryPatience);
     if (!page) return Failure{page.error()};
-    const Array* records = page.value().array("records");
-    for (const Value& one : records ? *records : Array()) {
-      const Dictionary* record = one.asDictionary();
-      const std::string* id = record ? record->string("id") : nullptr;
-      const std::string* end = record ? record->string("end") : nullptr;
+    for (const Dictionary* record : dictionariesIn(page.value(), "records")) {
+      const std::string* id = record->string("id");
+      const std::string* end = record->string("end");
       if (id) {
         places[*id] = items.size();
         items.push_back(itemOf(*record));
       } else if (const auto begun = end ? places.find(*end) : places.end(); begun != places.end()) {
-        for (const char* key : kEndKeys) items[begun->second].facts.set(key, fieldOrNull(*record, key));
+        for (const char* key : kEndKeys)
+          items[begun->second].facts.set(key, tools::orNull(record->find(key)));
       }
     }
     const Dictionary* following = page.value().dictionary("next");

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Lists, shows and removes what left.
-#include "tools/ctl/history_command.h"
+// `veltractl history`: lists, shows and removes what left.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -9,6 +9,7 @@
 
 #include "base/text.h"
 #include "formats/json.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/history_client.h"
 #include "tools/ctl/history_page.h"
 #include "tools/ctl/history_text.h"
@@ -32,7 +33,7 @@ int listHistory(ControlClient& daemon, const Options& options) {
     if (!printLine(options.json ? formats::writeJSON(item.facts) : lineOfItem(item))) return 1;
   }
   if (items.value().empty() && !options.json)
-    return printLine("Nothing is kept. \"history\" in etc/veltrad/policy.json says what is.") ? 0 : 1;
+    return printed("Nothing is kept. \"history\" in etc/veltrad/policy.json says what is.");
   return 0;
 }
 
@@ -58,35 +59,29 @@ int show(ControlClient& daemon, const Options& options) {
   }
   const std::string readable =
       item.digest ? withoutBody(item) : readableBody(item.text("kind"), body.value());
-  if (!options.json) return printLine(headOfItem(item) + "\n\n" + readable) ? 0 : 1;
+  if (!options.json) return printed(headOfItem(item) + "\n\n" + readable);
   Dictionary all = item.facts;
   all.set("headers", item.headers);
   all.set("readable", readable);
-  return printLine(formats::writeJSON(all)) ? 0 : 1;
+  return printed(formats::writeJSON(all));
 }
 
 int purge(ControlClient& daemon, const Options& options) {
   const auto removed = daemon.ask(wire::question::kPurgeHistory);
   if (!removed) return refused(removed.error());
-  const auto number = [&removed](const char* key) {
-    const Value* value = removed.value().find(key);
-    return value ? value->toInt64().value_or(0) : 0;
-  };
-  return printLine(options.json ? formats::writeJSON(removed.value())
-                                : fmt::format("{} records of {} days were removed, {} bytes.",
-                                              number("records"), number("days"), number("bytes")))
-             ? 0
-             : 1;
+  const Dictionary& counts = removed.value();
+  return printed(options.json ? formats::writeJSON(counts)
+                              : fmt::format("{} records of {} days were removed, {} bytes.",
+                                            numberIn(counts, "records"), numberIn(counts, "days"),
+                                            numberIn(counts, "bytes")));
 }
 
 }  // namespace
 
-int runHistory(const Options& options) {
-  auto daemon = ControlClient::connect(options.root);
-  if (!daemon) return refused(daemon.error());
-  if (options.command == Command::historyShow) return show(daemon.value(), options);
-  if (options.command == Command::historyPurge) return purge(daemon.value(), options);
-  return listHistory(daemon.value(), options);
+int runHistory(ControlClient& daemon, const Options& options) {
+  if (options.command == Command::historyShow) return show(daemon, options);
+  if (options.command == Command::historyPurge) return purge(daemon, options);
+  return listHistory(daemon, options);
 }
 
 }  // namespace veltrad::ctl

@@ -15,8 +15,11 @@
 #include "base/base64.h"
 #include "base/file_descriptor.h"
 #include "base/text.h"
+#include "http/host_name.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/history_text.h"
 #include "tools/ctl/readable_body.h"
+#include "tools/markup.h"
 
 namespace veltrad::ctl {
 
@@ -65,37 +68,11 @@ pre { background: var(--soft); padding: .6rem; border-radius: .4rem; overflow: a
 )";
 
 std::string html(std::string_view text) {
-  std::string out;
-  for (const char c : text) {
-    switch (c) {
-      case '&':
-        out += "&amp;";
-        break;
-      case '<':
-        out += "&lt;";
-        break;
-      case '>':
-        out += "&gt;";
-        break;
-      case '"':
-        out += "&quot;";
-        break;
-      default:
-        out += c;
-    }
-  }
-  return out;
-}
-
-// "https://a.example:8443/x" → "https://a.example:8443"
-std::string addressOf(const std::string& url) {
-  const std::size_t host = url.find("//");
-  return url.substr(0, url.find_first_of("/?#", host == std::string::npos ? 0 : host + 2));
+  return tools::escapedForMarkup(text);
 }
 
 std::int64_t bytesOf(const HistoryItem& item) {
-  const Value* bytes = item.facts.find("bytes");
-  return bytes ? bytes->toInt64().value_or(0) : 0;
+  return numberIn(item.facts, "bytes");
 }
 
 class Page {
@@ -106,7 +83,7 @@ class Page {
   void day(const std::string& name, const Items& items) {
     put("<section>\n<h2>" + html(name) + "</h2>\n");
     std::map<std::string, Items> byAddress;
-    for (const HistoryItem* item : items) byAddress[addressOf(item->text("to"))].push_back(item);
+    for (const HistoryItem* item : items) byAddress[http::addressOf(item->text("to"))].push_back(item);
     for (const auto& [address, sent] : byAddress) destination(address, sent);
     put("</section>\n");
   }
@@ -193,8 +170,9 @@ Result<Done, std::string> writeHistoryPage(const std::string& path, const std::v
                        timeText(static_cast<double>(std::time(nullptr)))));
   for (const auto& [day, sent] : byDay) page.day(day, sent);
   page.put("</main>\n</body>\n</html>\n");
-  if (page.error() != 0) return Failure{path + ": " + std::strerror(page.error())};
-  return Done();
+  if (page.error() == 0) return Done();
+  ::unlink(path.c_str());
+  return Failure{path + ": " + std::strerror(page.error())};
 }
 
 }  // namespace veltrad::ctl

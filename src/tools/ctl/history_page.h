@@ -15,7 +15,8 @@ namespace veltrad::ctl {
 using BodyOf = std::function<Result<std::string, std::string>(const HistoryItem&)>;
 
 // Writes the page to a new file, mode 0600: by day, newest first, destination and client, each item opening
-// to what exactly left. It needs no script, and nothing from elsewhere. The error is one line.
+// to what exactly left. It needs no script, and nothing from elsewhere. What could not be written whole is
+// taken away; the error is one line.
 Result<Done, std::string> writeHistoryPage(const std::string& path, const std::vector<HistoryItem>& items,
                                            const BodyOf& bodyOf);
 

@@ -9,6 +9,7 @@
 #include <ctime>
 
 #include "base/text.h"
+#include "tools/ctl/answer_fields.h"
 
 namespace veltrad::ctl {
 
@@ -23,8 +24,7 @@ std::optional<std::int64_t> numberOrNone(const Dictionary& from, const char* key
 
 std::string nameList(const HistoryItem& item, const char* key) {
   std::string all;
-  const Array* list = item.facts.array(key);
-  for (const Value& name : list ? *list : Array())
+  for (const Value& name : arrayIn(item.facts, key))
     all += (all.empty() ? "" : ", ") + escapedForLog(name.asString() ? *name.asString() : "");
   return all;
 }
@@ -44,7 +44,7 @@ std::string whatOf(const HistoryItem& item) {
   if (kind == "datagram") return "a datagram";
   if (kind == "file") return "a file";
   if (kind == "logData") return "log data";
-  const auto events = numberOrNone(item.facts, "events").value_or(0);
+  const auto events = numberIn(item.facts, "events");
   return fmt::format("{} event{}", events, events == 1 ? "" : "s");
 }
 
@@ -67,8 +67,8 @@ std::string whoseOf(const HistoryItem& item) {
 
 std::string lineOfItem(const HistoryItem& item) {
   return fmt::format("{}  {}  {} to {} ({} bytes) of {}: {}", item.text("id"), timeText(item.time()),
-                     whatOf(item), escapedForLog(item.text("to")),
-                     numberOrNone(item.facts, "bytes").value_or(0), whoseOf(item), outcomeOf(item));
+                     whatOf(item), escapedForLog(item.text("to")), numberIn(item.facts, "bytes"),
+                     whoseOf(item), outcomeOf(item));
 }
 
 std::vector<std::pair<std::string, std::string>> detailsOf(const HistoryItem& item) {
@@ -103,8 +103,8 @@ std::string headOfItem(const HistoryItem& item) {
 }
 
 std::string withoutBody(const HistoryItem& item) {
-  return fmt::format("The body was too large to be kept: {} bytes, SHA-256 {}",
-                     numberOrNone(item.facts, "bytes").value_or(0), item.digest.value_or("unknown"));
+  return fmt::format("The body was too large to be kept: {} bytes, SHA-256 {}", numberIn(item.facts, "bytes"),
+                     item.digest.value_or("unknown"));
 }
 
 }  // namespace veltrad::ctl

@@ -3,22 +3,18 @@
 #include <cstdio>
 #include <exception>
 
-#include "tools/ctl/config_command.h"
-#include "tools/ctl/doctor_command.h"
-#include "tools/ctl/history_command.h"
-#include "tools/ctl/options.h"
-#include "tools/ctl/privacy_command.h"
-#include "tools/ctl/refresh_command.h"
-#include "tools/ctl/report_command.h"
-#include "tools/ctl/send_command.h"
-#include "tools/ctl/session_command.h"
-#include "tools/ctl/spool_command.h"
-#include "tools/ctl/stats_command.h"
-#include "tools/ctl/status_command.h"
-#include "tools/ctl/why_command.h"
+#include "tools/ctl/commands.h"
+#include "tools/ctl/print.h"
 
 namespace veltrad::ctl {
 namespace {
+
+// A command that the daemon alone can answer.
+template <typename Run>
+int ask(const Options& options, Run run) {
+  auto daemon = ControlClient::connect(options.root);
+  return daemon ? run(daemon.value(), options) : refused(daemon.error());
+}
 
 int run(int argc, char** argv) {
   const auto parsed = parseOptions(argc, argv);
@@ -37,33 +33,35 @@ int run(int argc, char** argv) {
     case Command::doctor:
       return runDoctor(options);
     case Command::metrics:
-      return runMetrics(options);
+      return ask(options, runMetrics);
     case Command::config:
     case Command::configGet:
     case Command::configSet:
     case Command::configUnset:
       return runConfig(options);
     case Command::refresh:
-      return runRefresh(options);
+      return ask(options, runRefresh);
     case Command::report:
       return runReport(options);
     case Command::why:
-      return runWhy(options);
+      return ask(options, runWhy);
     case Command::watch:
-      return runWatch(options, interrupt);
+      return ask(options, [&interrupt](ControlClient& daemon, const Options& given) {
+        return runWatch(daemon, given, interrupt);
+      });
     case Command::privacy:
     case Command::privacyOff:
     case Command::privacyOn:
     case Command::privacyReset:
-      return runPrivacy(options);
+      return ask(options, runPrivacy);
     case Command::history:
     case Command::historyShow:
     case Command::historyPurge:
-      return runHistory(options);
+      return ask(options, runHistory);
     case Command::spool:
     case Command::spoolSend:
     case Command::spoolDrop:
-      return runSpool(options);
+      return ask(options, runSpool);
     case Command::session:
       return runSession(options, interrupt);
     default:

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Parses the command line. Only this file uses CLI11, and it catches its exceptions.
+// Parses the command line, and catches the exceptions of CLI11.
 #include "tools/ctl/options.h"
 
 #include <fmt/format.h>
@@ -10,9 +10,8 @@
 
 #include "base/text.h"
 #include "config/preference_keys.h"
-#include "tools/ctl/care_options.h"
+#include "tools/ctl/command_options.h"
 #include "tools/ctl/number_option.h"
-#include "tools/ctl/owner_options.h"
 #include "tools/key_value.h"
 #include "veltra/veltra.h"
 #include "wire/constants.h"

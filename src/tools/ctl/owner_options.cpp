@@ -1,29 +1,19 @@
 // SPDX-License-Identifier: Apache-2.0
 // Describes the commands for the owner of a device.
-#include "tools/ctl/owner_options.h"
+#include "tools/ctl/command_options.h"
 
 #include <CLI/CLI.hpp>
-
-#include "tools/ctl/care_options.h"
 
 namespace veltrad::ctl {
 namespace {
 
 constexpr const char* kOwnerGroup = "For the owner of a device";
 
-// The command itself, when none of its own is given: their callbacks run before.
-void isAlone(CLI::App* app, Options& options, Command command) {
-  app->group(kOwnerGroup);
-  app->final_callback([&options, app, command] {
-    if (app->get_subcommands().empty()) options.command = command;
-  });
-  app->require_subcommand(0, 1);
-}
-
 void addPrivacy(CLI::App& app, Options& options) {
-  CLI::App* privacy = addCommand(app, options, Command::privacy, "privacy",
-                                 "Show what may leave the device and what left, or stop all reporting");
-  isAlone(privacy, options, Command::privacy);
+  CLI::App* privacy =
+      addCommand(app, options, Command::privacy, "privacy",
+                 "Show what may leave the device and what left, or stop all reporting", kOwnerGroup);
+  privacy->require_subcommand(0, 1);
   addCommand(*privacy, options, Command::privacyOff, "off",
              "Stop all reporting now, and say what was dropped; outlives a restart");
   addCommand(*privacy, options, Command::privacyOn, "on", "Let back ends report again, if the policy does");
@@ -38,9 +28,9 @@ void addPrivacy(CLI::App& app, Options& options) {
 
 void addHistory(CLI::App& app, Options& options) {
   Care& care = options.care;
-  CLI::App* history =
-      addCommand(app, options, Command::history, "history", "Show what left the device, exactly as it left");
-  isAlone(history, options, Command::history);
+  CLI::App* history = addCommand(app, options, Command::history, "history",
+                                 "Show what left the device, exactly as it left", kOwnerGroup);
+  history->require_subcommand(0, 1);
   history->add_option("--html", care.html, "Write it as a page for a browser to FILE, a new one, mode 0600")
       ->type_name("FILE");
   CLI::App* show = addCommand(*history, options, Command::historyShow, "show",

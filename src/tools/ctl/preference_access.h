@@ -6,7 +6,6 @@
 #include <optional>
 #include <string>
 
-#include "base/file_descriptor.h"
 #include "base/result.h"
 #include "base/value.h"
 #include "tools/ctl/control_client.h"

@@ -30,6 +30,10 @@ void complain(std::string_view text) {
   std::fflush(stderr);
 }
 
+int printed(std::string_view line) {
+  return printLine(line) ? 0 : 1;
+}
+
 int refused(std::string_view why, int status) {
   complain(why);
   return status;

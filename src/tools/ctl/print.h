@@ -12,6 +12,8 @@ namespace veltrad::ctl {
 void remark(std::string_view line);
 // Prints "veltractl: …" on standard error.
 void complain(std::string_view text);
+// Prints a line; gives the status with which to exit.
+int printed(std::string_view line);
 // Complains; gives the status with which to exit.
 int refused(std::string_view why, int status = 1);
 

@@ -1,15 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks, and puts the answers into words.
-#include "tools/ctl/privacy_command.h"
+// `veltractl privacy`: asks, and puts the answers into words.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
+#include <algorithm>
 #include <cmath>
+#include <iterator>
 
 #include "base/text.h"
 #include "formats/json.h"
 #include "tools/ctl/answer_fields.h"
-#include "tools/ctl/control_client.h"
 #include "tools/ctl/history_text.h"
 #include "tools/ctl/print.h"
 #include "wire/names.h"
@@ -45,9 +46,7 @@ std::string orNothing(const std::string& text) {
 
 std::string formatIdentifiers(const Dictionary& answer) {
   std::string out = "identifiers";
-  for (const Value& one : arrayIn(answer, "identifiers")) {
-    const Dictionary* identifier = one.asDictionary();
-    if (!identifier) continue;
+  for (const Dictionary* identifier : dictionariesIn(answer, "identifiers")) {
     const auto made = identifier->real("made");
     out += fmt::format("\n  {:<16} {}{}{}", textIn(*identifier, "name"), textIn(*identifier, "value"),
                        made && std::isfinite(*made) ? "  made " + timeText(*made) : "",
@@ -67,23 +66,19 @@ std::string formatPrivacy(const Dictionary& answer) {
                               : "refused",
       policy ? escapedForLog(formats::writeJSON(*policy)) : orNothing(textIn(answer, "policy")),
       formatIdentifiers(answer));
-  for (const Value& one : arrayIn(answer, "destinations")) {
-    const Dictionary* destination = one.asDictionary();
-    if (!destination) continue;
+  const auto destinations = dictionariesIn(answer, "destinations");
+  for (const Dictionary* destination : destinations)
     out += fmt::format("\n  to {}: {}, {} bytes", textIn(*destination, "to"),
                        orNothing(amounts(*destination, {"events", "datagrams", "files", "logData"})),
                        numberIn(*destination, "bytes"));
-  }
-  return arrayIn(answer, "destinations").empty() ? out + "\n  nothing" : out;
+  return destinations.empty() ? out + "\n  nothing" : out;
 }
 
 std::string formatReceipt(const Dictionary& answer) {
   const Dictionary& dropped = dictionary(answer, "dropped");
   std::string out = "Reporting is off.\ndropped    " +
                     orNothing(amounts(dropped, {"events", "datagrams", "files", "posts"}));
-  for (const Value& one : arrayIn(dropped, "byClient")) {
-    const Dictionary* client = one.asDictionary();
-    if (!client) continue;
+  for (const Dictionary* client : dictionariesIn(dropped, "byClient")) {
     const std::string name = textIn(*client, "client"), service = textIn(*client, "service");
     const std::string who = name.empty() ? fmt::format("client type {}", numberIn(*client, "clientType"))
                                          : fmt::format("{}{}{}", name, service.empty() ? "" : "/", service);
@@ -99,48 +94,35 @@ std::string formatReceipt(const Dictionary& answer) {
                    numberIn(disk, "messageLog"), numberIn(disk, "energyLog"), numberIn(disk, "history"));
 }
 
-std::string wordsOf(Command command, const Dictionary& answer) {
-  switch (command) {
-    case Command::privacyOff:
-      return formatReceipt(answer);
-    case Command::privacyOn:
-      return textIn(answer, "reporting") == "on"
-                 ? "Reporting is on."
-                 : "Reporting stays off: etc/veltrad/policy.json says so, or it is broken.";
-    case Command::privacyReset:
-      return formatIdentifiers(answer);
-    default:
-      return formatPrivacy(answer);
-  }
+std::string formatOn(const Dictionary& answer) {
+  return textIn(answer, "reporting") == "on"
+             ? "Reporting is on."
+             : "Reporting stays off: etc/veltrad/policy.json says so, or it is broken.";
 }
 
-const char* questionOf(Command command) {
-  switch (command) {
-    case Command::privacyOff:
-      return question::kTurnReportingOff;
-    case Command::privacyOn:
-      return question::kTurnReportingOn;
-    case Command::privacyReset:
-      return question::kResetIdentifiers;
-    default:
-      return question::kPrivacy;
-  }
-}
+struct Question {
+  Command command;
+  const char* name;
+  std::string (*words)(const Dictionary& answer);
+};
+constexpr Question kQuestions[] = {
+    {Command::privacy, question::kPrivacy, formatPrivacy},
+    {Command::privacyOff, question::kTurnReportingOff, formatReceipt},
+    {Command::privacyOn, question::kTurnReportingOn, formatOn},
+    {Command::privacyReset, question::kResetIdentifiers, formatIdentifiers},
+};
 
 }  // namespace
 
-int runPrivacy(const Options& options) {
-  auto daemon = ControlClient::connect(options.root);
-  const auto answer = daemon ? daemon.value().ask(questionOf(options.command))
-                             : Result<Dictionary, std::string>(Failure{daemon.error()});
-  if (!answer) {
-    complain(answer.error());
-    return 1;
-  }
-  const bool printed =
-      printLine(options.json ? formats::writeJSON(answer.value()) : wordsOf(options.command, answer.value()));
+int runPrivacy(ControlClient& daemon, const Options& options) {
+  const auto* asked = std::find_if(std::begin(kQuestions), std::end(kQuestions),
+                                   [&](const Question& one) { return one.command == options.command; });
+  const auto answer = daemon.ask(asked->name);
+  if (!answer) return refused(answer.error());
+  const int status =
+      printed(options.json ? formats::writeJSON(answer.value()) : asked->words(answer.value()));
   const bool staysOff = options.command == Command::privacyOn && textIn(answer.value(), "reporting") != "on";
-  return printed && !staysOff ? 0 : 1;
+  return staysOff ? 1 : status;
 }
 
 }  // namespace veltrad::ctl

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// One question a storebag, so that a slow server delays its own line alone.
-#include "tools/ctl/refresh_command.h"
+// `veltractl refresh`: one question a storebag, so that a slow server delays its own line alone.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -9,7 +9,6 @@
 
 #include "formats/json.h"
 #include "tools/ctl/answer_fields.h"
-#include "tools/ctl/control_client.h"
 #include "tools/ctl/print.h"
 #include "wire/names.h"
 
@@ -25,11 +24,9 @@ Result<std::vector<std::string>, std::string> namesToRefresh(ControlClient& daem
   const auto status = daemon.ask(wire::question::kStatus);
   if (!status) return Failure{status.error()};
   std::vector<std::string> all, asked;
-  const Array* storebags = status.value().array("storebags");
-  for (const Value& one : storebags ? *storebags : Array()) {
-    const Dictionary* storebag = one.asDictionary();
-    const std::string* name = storebag ? storebag->string("name") : nullptr;
-    const std::string* state = storebag ? storebag->string("state") : nullptr;
+  for (const Dictionary* storebag : dictionariesIn(status.value(), "storebags")) {
+    const std::string* name = storebag->string("name");
+    const std::string* state = storebag->string("state");
     if (!name || !state) continue;
     all.push_back(*name);
     if (*state != "never") asked.push_back(*name);
@@ -49,23 +46,14 @@ std::string lineOf(const Dictionary& storebag, bool fetched) {
 
 }  // namespace
 
-int runRefresh(const Options& options) {
-  auto daemon = ControlClient::connect(options.root);
-  auto names = !daemon ? Result<std::vector<std::string>, std::string>(Failure{daemon.error()})
-               : options.care.key.empty() ? namesToRefresh(daemon.value())
-                                          : std::vector{options.care.key};
-  if (!names) {
-    complain(names.error());
-    return 1;
-  }
+int runRefresh(ControlClient& daemon, const Options& options) {
+  const auto names = options.care.key.empty() ? namesToRefresh(daemon) : std::vector{options.care.key};
+  if (!names) return refused(names.error());
   Array storebags;
   bool all = true;
   for (const std::string& name : names.value()) {
-    auto answer = daemon.value().ask(wire::question::kRefresh, {{"name", name}}, kRefreshPatience);
-    if (!answer) {
-      complain(answer.error());
-      return 1;
-    }
+    auto answer = daemon.ask(wire::question::kRefresh, {{"name", name}}, kRefreshPatience);
+    if (!answer) return refused(answer.error());
     const bool fetched = textIn(answer.value(), "result") == "fetched";
     all = all && fetched;
     if (!options.json && !printLine(lineOf(answer.value(), fetched))) return 1;

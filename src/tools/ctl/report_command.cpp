@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Shown first, then written.
-#include "tools/ctl/report_command.h"
+// `veltractl report`: shown first, then written.
+#include "tools/ctl/commands.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -43,26 +43,17 @@ int writeNew(const std::string& path, std::string_view text) {
 
 int runReport(const Options& options) {
   const auto& output = options.care.output;
-  if (output && !options.care.yes && ::isatty(STDIN_FILENO) == 0) {
-    complain("--output asks before it writes, and there is no terminal: add --yes.");
-    return kWrongUsage;
-  }
+  if (output && !options.care.yes && ::isatty(STDIN_FILENO) == 0)
+    return refused("--output asks before it writes, and there is no terminal: add --yes.", kWrongUsage);
   struct stat status {};
-  if (output && ::lstat(output->c_str(), &status) == 0) {
-    complain(fmt::format("{} exists, and a report replaces no file: choose another name.", *output));
-    return 1;
-  }
+  if (output && ::lstat(output->c_str(), &status) == 0)
+    return refused(fmt::format("{} exists, and a report replaces no file: choose another name.", *output));
   const std::string report = reportText(options);
   if (!printLine(report)) return 1;
   if (!output) return 0;
-  if (!options.care.yes && !agreed(*output)) {
-    complain("Nothing was written.");
-    return 1;
-  }
-  if (const int error = writeNew(*output, report + '\n')) {
-    complain(fmt::format("{} was not written: {}.", *output, std::strerror(error)));
-    return 1;
-  }
+  if (!options.care.yes && !agreed(*output)) return refused("Nothing was written.");
+  if (const int error = writeNew(*output, report + '\n'))
+    return refused(fmt::format("{} was not written: {}.", *output, std::strerror(error)));
   fmt::print(stderr, "Written to {}.\n", *output);
   return 0;
 }

@@ -6,7 +6,6 @@
 #include <sys/utsname.h>
 
 #include <algorithm>
-#include <cctype>
 #include <chrono>
 #include <filesystem>
 #include <set>
@@ -19,13 +18,13 @@
 #include "formats/property_list.h"
 #include "platform/file_store.h"
 #include "platform/root.h"
+#include "tools/ctl/answer_fields.h"
 #include "tools/ctl/child_output.h"
-#include "tools/ctl/config_command.h"
+#include "tools/ctl/commands.h"
 #include "tools/ctl/control_client.h"
 #include "tools/ctl/counters_report.h"
 #include "tools/ctl/preference_access.h"
 #include "tools/ctl/redaction.h"
-#include "tools/ctl/status_command.h"
 #include "tools/ctl/status_report.h"
 #include "veltra/veltra.h"
 #include "wire/names.h"
@@ -72,9 +71,8 @@ std::string preferencesSection(const Options& options) {
   const auto answer = access.value().ask(wire::question::kConfig);
   if (!answer) return cannot(answer.error());
   Array kept;
-  const Array* keys = answer.value().array("keys");
-  for (const Value& one : keys ? *keys : Array()) {
-    Dictionary listed = one.asDictionary() ? *one.asDictionary() : Dictionary();
+  for (const Dictionary* one : dictionariesIn(answer.value(), "keys")) {
+    Dictionary listed = *one;
     const std::string* name = listed.string("name");
     const config::PreferenceKey* key = name ? config::preferenceNamed(*name) : nullptr;
     if ((!key || key->identifies) && listed.string("value")) listed.set("value", "(left out)");

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Makes one call and prints its answer.
-#include "tools/ctl/send_command.h"
+// `veltractl send` and its like: makes one call and prints its answer.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -56,8 +56,7 @@ Called call(ClientSession& session, const Options& options, const Array& logData
 
 // Prints why there is no answer.
 int failed(const std::optional<Answer>& answer) {
-  complain(answer ? answer->error->description : "Interrupted.");
-  return 1;
+  return refused(answer ? answer->error->description : "Interrupted.");
 }
 
 int finishSend(const Options& options, const Answer& answer) {
@@ -65,9 +64,8 @@ int finishSend(const Options& options, const Answer& answer) {
   if (answer.status != VELTRA_OK) return failed(answer);
   for (const std::string& line : outcomeLines(answer)) remark(line);
   if (!options.expectReported || reported(answer)) return 0;
-  complain(answer.outcomes ? "No back end reports the message."
-                           : "The daemon is too old to say whether a back end reports the message.");
-  return 1;
+  return refused(answer.outcomes ? "No back end reports the message."
+                                 : "The daemon is too old to say whether a back end reports the message.");
 }
 
 int finish(const Options& options, const Called& called) {
@@ -78,8 +76,7 @@ int finish(const Options& options, const Called& called) {
   if (answer->status != VELTRA_OK) return failed(answer);
   if (operation == Operation::uploadFile) return reportUpload(options.file, *answer) ? 0 : 1;
   if (operation != Operation::uploadLogData || answer->uploaded) return 0;
-  complain("Nobody took the log data: see what the daemon's log says.");
-  return 1;
+  return refused("Nobody took the log data: see what the daemon's log says.");
 }
 
 }  // namespace
@@ -89,18 +86,13 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
   Array logData;
   if (options.command == Command::uploadLogData) {
     auto read = readLogData(options.file);
-    if (!read) {
-      complain(read.error());
-      return 2;
-    }
+    if (!read) return refused(read.error(), 2);
     logData = std::move(read).value();
   }
   const bool oneShot = options.command == Command::oneShot;
   if (const auto problem =
-          oneShot ? session.openUndescribed(options.root) : session.open(options.root, options.identity)) {
-    complain(*problem);
-    return 1;
-  }
+          oneShot ? session.openUndescribed(options.root) : session.open(options.root, options.identity))
+    return refused(*problem);
   if (!oneShot) {
     const auto started = session.start();
     if (!started || started->status != VELTRA_OK) return failed(started);

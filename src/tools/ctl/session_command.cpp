@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Runs the lines of a session.
-#include "tools/ctl/session_command.h"
+// `veltractl session`: runs the lines of a session.
+#include "tools/ctl/commands.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -27,10 +27,7 @@ class SessionRun {
   Ended start() {
     const auto answer = _session.start();
     if (!answer) return 0;
-    if (answer->status != VELTRA_OK) {
-      complain(answer->error->description);
-      return 1;
-    }
+    if (answer->status != VELTRA_OK) return refused(answer->error->description);
     return print(formatAnswer(Operation::start, *answer));
   }
 
@@ -43,9 +40,8 @@ class SessionRun {
     if (answer->status != VELTRA_OK) ++_unanswered;
     const Ended ended = print(formatAnswer(operation, *answer));
     if (ended || answer->status != VELTRA_NO_DAEMON) return ended;
-    complain(
+    return refused(
         "The connection to the daemon has ended: see whether veltrad still runs, and start a new session.");
-    return 1;
   }
 
   Ended malformed(std::uint64_t number, std::string_view description) {
@@ -55,8 +51,7 @@ class SessionRun {
   // The exit status at the end of the input.
   int end() const {
     if (_unanswered == 0) return 0;
-    complain(fmt::format("Calls that ended without an answer: {}.", _unanswered));
-    return 1;
+    return refused(fmt::format("Calls that ended without an answer: {}.", _unanswered));
   }
 
  private:
@@ -67,19 +62,21 @@ class SessionRun {
       case Operation::restart:
         return _session.start();
       case Operation::send:
-        return _session.send(line.message);
+        return _session.send(line.fields);
       case Operation::oneShot:
         break;
       case Operation::flush:
         return _session.flush();
-      case Operation::states:
-        return _session.states(line.userInfo);
+      case Operation::states: {
+        const Dictionary* userInfo = line.fields.dictionary("userInfo");
+        return _session.states(userInfo ? std::optional(*userInfo) : std::nullopt);
+      }
       case Operation::displayURL:
         return _session.displayURL();
       case Operation::uploadFile:
-        return _session.uploadFile(line.path);
+        return _session.uploadFile(*line.fields.string("path"));
       case Operation::uploadLogData:
-        return _session.uploadLogData(line.data);
+        return _session.uploadLogData(*line.fields.array("data"));
       case Operation::finish:
         return _session.finish();
       case Operation::sleep:
@@ -111,8 +108,7 @@ int runLines(SessionRun& run, LineReader& lines) {
       case LineReader::Got::interrupted:
         return run.end();
       case LineReader::Got::failed:
-        complain(fmt::format("Cannot read the input: {}.", std::strerror(errno)));
-        return 2;
+        return refused(fmt::format("Cannot read the input: {}.", std::strerror(errno)), 2);
     }
     if (ended) return *ended;
   }
@@ -124,24 +120,19 @@ int runSession(const Options& options, Interrupt& interrupt) {
   FileDescriptor file;
   if (options.input) {
     file = FileDescriptor(open(options.input->c_str(), O_RDONLY | O_CLOEXEC));
-    if (file.get() < 0) {
-      complain(fmt::format("--input {}: {}", *options.input, std::strerror(errno)));
-      return 2;
-    }
+    if (file.get() < 0)
+      return refused(fmt::format("--input {}: {}", *options.input, std::strerror(errno)), 2);
   }
   // If a copy cannot be printed, printing the next answer fails too, which ends the session.
   const auto printCopy = [](const AggregatedCopy& copy) {
     static_cast<void>(printLine(formatAggregated(copy)));
   };
   ClientSession session(interrupt, options.aggregate ? ClientSession::CopyHandler(printCopy) : nullptr);
-  if (const auto problem = session.open(options.root, options.identity)) {
-    complain(*problem);
-    return 1;
-  }
+  if (const auto problem = session.open(options.root, options.identity)) return refused(*problem);
   SessionRun run(session, interrupt);
-  const Ended refused = run.start();
+  const Ended ended = run.start();
   LineReader lines(options.input ? file.get() : STDIN_FILENO, kLongestLine, interrupt);
-  const int status = refused ? *refused : runLines(run, lines);
+  const int status = ended ? *ended : runLines(run, lines);
   if (const std::uint64_t lost = session.close())
     complain(fmt::format("Calls that were lost unsent: {}.", lost));
   return status;

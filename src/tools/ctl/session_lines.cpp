@@ -16,85 +16,70 @@ namespace {
 constexpr const char* kExpectedOperations =
     "expected one of send, flush, states, displayURL, uploadFile, uploadLogData, restart, sleep, finish";
 
+constexpr const char* kPause = "ms";
+constexpr const char* kExpectedPause = "an integer from 0 to 3600000";
+static_assert(kLongestSleep.count() == 3'600'000);
+
 // What is wrong with a line, if anything is.
 using Problem = std::optional<std::string>;
-
-Problem notOfType(const char* key, Operation operation, const char* expected, const Value& found) {
-  return fmt::format("\"{}\" of {}: expected {}, found {}", key, operationName(operation), expected,
-                     typeName(found));
-}
 
 bool isInteger(const Value& value) {
   return value.type() == Value::Type::signedInteger || value.type() == Value::Type::unsignedInteger;
 }
+bool isText(const Value& value) {
+  return value.asString() != nullptr;
+}
+bool isArray(const Value& value) {
+  return value.asArray() != nullptr;
+}
+bool isObject(const Value& value) {
+  return value.asDictionary() != nullptr;
+}
 
-Problem readSend(const Dictionary& line, SessionLine& result) {
-  const Value* payload = line.find(wire::kVeltraMessageParametersPayload);
-  if (payload && !payload->asDictionary()) {
-    return notOfType(wire::kVeltraMessageParametersPayload, Operation::send, "an object", *payload);
+enum class Need { optional, required };
+
+struct Field {
+  Operation operation;
+  const char* key;
+  Need need;
+  bool (*fits)(const Value&);
+  const char* expected;
+};
+constexpr Field kFields[] = {
+    {Operation::send, wire::kVeltraMessageParametersPayload, Need::optional, isObject, "an object"},
+    {Operation::send, wire::kVeltraMessageParametersFlag, Need::optional, isInteger, "an integer"},
+    {Operation::states, "userInfo", Need::optional, isObject, "an object"},
+    {Operation::uploadFile, "path", Need::required, isText, "a text"},
+    {Operation::uploadLogData, "data", Need::required, isArray, "an array"},
+    {Operation::sleep, kPause, Need::required, isInteger, kExpectedPause},
+};
+
+Problem problemOfFields(const SessionLine& line) {
+  const char* name = operationName(line.operation);
+  for (const auto& [operation, key, need, fits, expected] : kFields) {
+    if (operation != line.operation) continue;
+    const Value* value = line.fields.find(key);
+    if (!value && need == Need::required)
+      return fmt::format("no \"{}\" in {}: expected {}", key, name, expected);
+    if (value && !fits(*value))
+      return fmt::format("\"{}\" of {}: expected {}, found {}", key, name, expected, typeName(*value));
   }
-  const Value* flag = line.find(wire::kVeltraMessageParametersFlag);
-  if (flag && !isInteger(*flag)) {
-    return notOfType(wire::kVeltraMessageParametersFlag, Operation::send, "an integer", *flag);
-  }
-  result.message = line;
-  result.message.erase("op");
   return std::nullopt;
 }
 
-Problem readStates(const Dictionary& line, SessionLine& result) {
-  const Value* userInfo = line.find("userInfo");
-  if (!userInfo) return std::nullopt;
-  if (!userInfo->asDictionary()) return notOfType("userInfo", Operation::states, "an object", *userInfo);
-  result.userInfo = *userInfo->asDictionary();
-  return std::nullopt;
-}
-
-Problem readUploadFile(const Dictionary& line, SessionLine& result) {
-  const Value* path = line.find("path");
-  if (!path) return "no \"path\" in uploadFile: expected a text";
-  if (!path->asString()) return notOfType("path", Operation::uploadFile, "a text", *path);
-  result.path = *path->asString();
-  if (result.path.find('\0') == std::string::npos) return std::nullopt;
+Problem readPath(const SessionLine& line) {
+  if (line.fields.string("path")->find('\0') == std::string::npos) return std::nullopt;
   return "\"path\" of uploadFile holds a NUL character: expected none";
 }
 
-Problem readUploadLogData(const Dictionary& line, SessionLine& result) {
-  const Value* data = line.find("data");
-  if (!data) return "no \"data\" in uploadLogData: expected an array";
-  if (!data->asArray()) return notOfType("data", Operation::uploadLogData, "an array", *data);
-  result.data = *data->asArray();
+Problem readPause(SessionLine& line) {
+  const Value& ms = *line.fields.find(kPause);
+  const auto count = ms.toInt64();
+  if (!count || *count < 0 || *count > kLongestSleep.count())
+    return fmt::format("\"{}\" of sleep: expected {}, found {}", kPause, kExpectedPause,
+                       formats::writeJSON(ms));
+  line.duration = std::chrono::milliseconds(*count);
   return std::nullopt;
-}
-
-Problem readSleep(const Dictionary& line, SessionLine& result) {
-  const std::string expected = fmt::format("expected an integer from 0 to {}", kLongestSleep.count());
-  const Value* ms = line.find("ms");
-  if (!ms) return fmt::format("no \"ms\" in sleep: {}", expected);
-  const auto count = isInteger(*ms) ? ms->toInt64() : std::nullopt;
-  if (!count) return fmt::format("\"ms\" of sleep: {}, found {}", expected, typeName(*ms));
-  if (*count < 0 || *count > kLongestSleep.count()) {
-    return fmt::format("\"ms\" of sleep: {}, found {}", expected, formats::writeJSON(*ms));
-  }
-  result.duration = std::chrono::milliseconds(*count);
-  return std::nullopt;
-}
-
-Problem readFields(const Dictionary& line, SessionLine& result) {
-  switch (result.operation) {
-    case Operation::send:
-      return readSend(line, result);
-    case Operation::states:
-      return readStates(line, result);
-    case Operation::uploadFile:
-      return readUploadFile(line, result);
-    case Operation::uploadLogData:
-      return readUploadLogData(line, result);
-    case Operation::sleep:
-      return readSleep(line, result);
-    default:
-      return std::nullopt;
-  }
 }
 
 Result<Operation, std::string> operationOf(const Dictionary& line) {
@@ -131,9 +116,12 @@ Result<SessionLine, std::string> parseSessionLine(std::string_view line) {
   if (!operation) return Failure{operation.error()};
   if (hasUnsendableKey(json.value()))
     return Failure{std::string("a key holds a NUL character: expected none")};
-  SessionLine result;
-  result.operation = operation.value();
-  if (auto problem = readFields(*fields, result)) return Failure{*problem};
+  SessionLine result{operation.value(), *fields};
+  result.fields.erase("op");
+  Problem problem = problemOfFields(result);
+  if (!problem && result.operation == Operation::uploadFile) problem = readPath(result);
+  if (!problem && result.operation == Operation::sleep) problem = readPause(result);
+  if (problem) return Failure{*problem};
   return result;
 }
 

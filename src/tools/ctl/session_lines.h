@@ -3,7 +3,6 @@
 #pragma once
 
 #include <chrono>
-#include <optional>
 #include <string>
 #include <string_view>
 
@@ -17,13 +16,11 @@ namespace veltrad::ctl {
 inline constexpr std::size_t kLongestLine = 64u << 20;
 inline constexpr std::chrono::milliseconds kLongestSleep = std::chrono::hours(1);
 
-// An operation and its arguments. The message of a send is the line without "op".
 struct SessionLine {
-  Operation operation = Operation::flush;
-  Dictionary message;
-  std::optional<Dictionary> userInfo;
-  std::string path;
-  Array data;
+  Operation operation;
+  // The line without "op". Those that the operation reads have the right type.
+  Dictionary fields;
+  // Of a sleep.
   std::chrono::milliseconds duration{0};
 };
 

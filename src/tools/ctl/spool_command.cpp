@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Lists, hurries and drops what is kept.
-#include "tools/ctl/spool_command.h"
+// `veltractl spool`: lists, hurries and drops what is kept.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -9,7 +9,6 @@
 
 #include "formats/json.h"
 #include "tools/ctl/answer_fields.h"
-#include "tools/ctl/control_client.h"
 #include "tools/ctl/history_text.h"
 #include "tools/ctl/print.h"
 #include "tools/ctl/status_report.h"
@@ -40,10 +39,7 @@ int listSpool(ControlClient& daemon, const Options& options) {
     const auto page = daemon.ask(question::kSpool, arguments);
     if (!page) return refused(page.error());
     const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
-    const Array* posts = page.value().array("posts");
-    for (const Value& one : posts ? *posts : Array()) {
-      const Dictionary* post = one.asDictionary();
-      if (!post) continue;
+    for (const Dictionary* post : dictionariesIn(page.value(), "posts")) {
       ++count;
       if (!printLine(options.json ? formats::writeJSON(*post) : lineOfPost(*post, now.count()))) return 1;
     }
@@ -51,8 +47,7 @@ int listSpool(ControlClient& daemon, const Options& options) {
     if (!next) break;
     arguments.set("after", *next);
   }
-  if (count == 0 && !options.json) return printLine("Nothing is in the spool.") ? 0 : 1;
-  return 0;
+  return count == 0 && !options.json ? printed("Nothing is in the spool.") : 0;
 }
 
 int change(ControlClient& daemon, const Options& options) {
@@ -62,19 +57,14 @@ int change(ControlClient& daemon, const Options& options) {
   const auto done = daemon.ask(sends ? question::kSendSpool : question::kDropFromSpool, arguments);
   if (!done) return refused(done.error());
   const char* words = sends ? "posts leave now, as fast as the pace allows." : "posts were dropped.";
-  return printLine(options.json ? formats::writeJSON(done.value())
-                                : fmt::format("{} {}", numberIn(done.value(), "posts"), words))
-             ? 0
-             : 1;
+  return printed(options.json ? formats::writeJSON(done.value())
+                              : fmt::format("{} {}", numberIn(done.value(), "posts"), words));
 }
 
 }  // namespace
 
-int runSpool(const Options& options) {
-  auto daemon = ControlClient::connect(options.root);
-  if (!daemon) return refused(daemon.error());
-  return options.command == Command::spool ? listSpool(daemon.value(), options)
-                                           : change(daemon.value(), options);
+int runSpool(ControlClient& daemon, const Options& options) {
+  return options.command == Command::spool ? listSpool(daemon, options) : change(daemon, options);
 }
 
 }  // namespace veltrad::ctl

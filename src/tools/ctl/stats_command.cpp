@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads and prints the daemon's counters.
-#include "tools/ctl/stats_command.h"
+// `veltractl stats`: reads and prints the daemon's counters.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 #include <signal.h>
@@ -23,16 +23,13 @@ bool isAlive(std::int64_t pid) {
 
 int noFile(const std::string& path, const platform::FileFailure& failure) {
   using Kind = platform::FileFailure::Kind;
-  if (failure.kind == Kind::notFound) {
-    complain(fmt::format(
+  if (failure.kind == Kind::notFound)
+    return refused(fmt::format(
         "No daemon has counted anything in {}: start veltrad, or name its root with VELTRA_ROOT or --root.",
         path));
-  } else if (failure.kind == Kind::noAccess) {
-    complain(fmt::format("{}: run veltractl as the user that runs veltrad.", failure.description));
-  } else {
-    complain(failure.description);
-  }
-  return 1;
+  if (failure.kind == Kind::noAccess)
+    return refused(fmt::format("{}: run veltractl as the user that runs veltrad.", failure.description));
+  return refused(failure.description);
 }
 
 }  // namespace
@@ -43,17 +40,14 @@ int runStats(const Options& options) {
   const auto file = platform::DiskFileStore().read(path, kLargestCounters);
   if (!file) return noFile(path, file.error());
   const auto report = readCounters(file.value());
-  if (!report) {
-    complain(
+  if (!report)
+    return refused(
         fmt::format("{}: expected the counters of veltrad, found something else; restart veltrad.", path));
-    return 1;
-  }
   std::string_view text = file.value();
   while (!text.empty() && text.back() == '\n') text.remove_suffix(1);
   if (!printLine(options.json ? std::string(text) : formatCounters(*report))) return 1;
   if (isAlive(report->pid)) return 0;
-  complain("veltrad is not running, and these are the counts of its last run: start it for new ones.");
-  return 1;
+  return refused("veltrad is not running, and these are the counts of its last run: start it for new ones.");
 }
 
 }  // namespace veltrad::ctl

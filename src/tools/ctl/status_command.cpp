@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks, puts the pages together, prints.
-#include "tools/ctl/status_command.h"
+// `veltractl status` and `veltractl metrics`: asks, puts the pages together, prints.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 #include <unistd.h>
@@ -8,8 +8,6 @@
 #include <chrono>
 
 #include "formats/json.h"
-#include "tools/ctl/control_client.h"
-#include "tools/ctl/interrupt.h"
 #include "tools/ctl/print.h"
 #include "tools/ctl/status_report.h"
 #include "wire/names.h"
@@ -20,7 +18,7 @@ namespace {
 
 constexpr std::chrono::seconds kRedraw{1};
 
-std::string printed(const Options& options, const Dictionary& status) {
+std::string textOf(const Options& options, const Dictionary& status) {
   if (options.json) return formats::writeJSON(status);
   const std::chrono::duration<double> now = std::chrono::system_clock::now().time_since_epoch();
   return formatStatus(status, now.count());
@@ -28,7 +26,7 @@ std::string printed(const Options& options, const Dictionary& status) {
 
 bool printStatus(const Options& options, bool redraw) {
   const auto status = askForStatus(options);
-  std::string text = status ? printed(options, status.value()) : std::string();
+  std::string text = status ? textOf(options, status.value()) : std::string();
   if (!redraw && !status) complain(status.error());
   if (!redraw) return status && printLine(text);
   // The cursor to the top, each line to its end and then the rest of the screen cleared: nothing flickers.
@@ -76,16 +74,12 @@ int runStatus(const Options& options, Interrupt& interrupt) {
   return 0;
 }
 
-int runMetrics(const Options& options) {
-  auto client = ControlClient::connect(options.root);
-  auto answer = client ? client.value().ask(wire::question::kMetrics)
-                       : Result<Dictionary, std::string>(Failure{client.error()});
-  const std::string* text = answer ? answer.value().string("text") : nullptr;
-  if (!text) {
-    complain(answer ? "veltrad answered without metrics." : answer.error());
-    return 1;
-  }
-  return printLine(std::string_view(*text).substr(0, text->size() - 1)) ? 0 : 1;
+int runMetrics(ControlClient& daemon, const Options&) {
+  const auto answer = daemon.ask(wire::question::kMetrics);
+  if (!answer) return refused(answer.error());
+  const std::string* text = answer.value().string("text");
+  if (!text) return refused("veltrad answered without metrics.");
+  return printed(std::string_view(*text).substr(0, text->size() - 1));
 }
 
 }  // namespace veltrad::ctl

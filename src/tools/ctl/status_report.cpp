@@ -7,7 +7,6 @@
 #include <cmath>
 #include <cstdint>
 #include <map>
-#include <set>
 #include <vector>
 
 #include "tools/ctl/answer_fields.h"
@@ -49,9 +48,7 @@ void addSession(std::string& out, const Dictionary& session, const std::string& 
                      textIn(session, "clientName", "no client name") + " / " +
                          textIn(session, "serviceName", "no service name"),
                      clientType ? fmt::format("{}", *clientType) : "unknown");
-  for (const Value& one : arrayIn(session, "backends")) {
-    const Dictionary* backend = one.asDictionary();
-    if (!backend) continue;
+  for (const Dictionary* backend : dictionariesIn(session, "backends")) {
     const Dictionary* reason = backend->dictionary("reason");
     out +=
         fmt::format("\n{}  {:<13} {} ({} held, {} under way, last: {})", indent, textIn(*backend, "name", ""),
@@ -59,9 +56,8 @@ void addSession(std::string& out, const Dictionary& session, const std::string& 
                     numberIn(*backend, "held"), numberIn(*backend, "underWay"),
                     textIn(*backend, "lastOutcome", "nothing yet"));
   }
-  for (const Value& child : arrayIn(session, "children")) {
-    if (const Dictionary* dictionary = child.asDictionary()) addSession(out, *dictionary, indent + "    ");
-  }
+  for (const Dictionary* child : dictionariesIn(session, "children"))
+    addSession(out, *child, indent + "    ");
 }
 
 void addDaemon(std::string& out, const Dictionary& daemon) {
@@ -69,9 +65,7 @@ void addDaemon(std::string& out, const Dictionary& daemon) {
   out += fmt::format("veltrad {}, process {}, up {}, {:.1f} MiB resident", textIn(daemon, "version", "?"),
                      numberIn(daemon, "pid"), formatDuration(real(daemon, "uptime").value_or(0)),
                      memory ? static_cast<double>(numberIn(*memory, "resident")) / (1 << 20) : 0.0);
-  for (const Value& one : arrayIn(daemon, "limits")) {
-    const Dictionary* limit = one.asDictionary();
-    if (!limit) continue;
+  for (const Dictionary* limit : dictionariesIn(daemon, "limits")) {
     const double used = static_cast<double>(numberIn(*limit, "used"));
     const double most = static_cast<double>(numberIn(*limit, "limit"));
     const std::string name = textIn(*limit, "name", "");
@@ -82,12 +76,10 @@ void addDaemon(std::string& out, const Dictionary& daemon) {
   if (daemon.string("clock")) out += "\n  the clock is " + textIn(daemon, "clock", "");
 }
 
-void addStorebags(std::string& out, const Array& storebags, double now) {
+void addStorebags(std::string& out, const Dictionary& status, double now) {
   std::size_t never = 0;
   out += "\n\nStorebags";
-  for (const Value& one : storebags) {
-    const Dictionary* storebag = one.asDictionary();
-    if (!storebag) continue;
+  for (const Dictionary* storebag : dictionariesIn(status, "storebags")) {
     const auto age = real(*storebag, "age");
     if (!age) {
       ++never;
@@ -105,12 +97,10 @@ void addStorebags(std::string& out, const Array& storebags, double now) {
   if (never > 0) out += fmt::format("\n  {} others: no session has asked for them", never);
 }
 
-void addServers(std::string& out, const Array& servers, double now) {
-  if (servers.empty()) return;
-  out += "\n\nServers";
-  for (const Value& one : servers) {
-    const Dictionary* server = one.asDictionary();
-    if (!server) continue;
+void addServers(std::string& out, const Dictionary& status, double now) {
+  const auto servers = dictionariesIn(status, "servers");
+  if (!servers.empty()) out += "\n\nServers";
+  for (const Dictionary* server : servers) {
     const auto last = real(*server, "lastSuccess");
     out += fmt::format("\n  {}: last success {}, {} failures since", textIn(*server, "address", ""),
                        last ? formatDuration(now - *last) + " ago" : "never", numberIn(*server, "failures"));
@@ -121,9 +111,7 @@ void addSpool(std::string& out, const Dictionary& spool, double now) {
   const auto oldest = real(spool, "oldest");
   out += fmt::format("\n\nSpool\n  {} posts, {} bytes{}", numberIn(spool, "posts"), numberIn(spool, "bytes"),
                      oldest ? ", the oldest " + formatDuration(now - *oldest) + " old" : "");
-  for (const Value& one : arrayIn(spool, "addresses")) {
-    const Dictionary* address = one.asDictionary();
-    if (!address) continue;
+  for (const Dictionary* address : dictionariesIn(spool, "addresses")) {
     const double wait = real(*address, "nextTry").value_or(now) - now;
     out += fmt::format("\n  {}: {} posts, last error: {}, next try {}", textIn(*address, "address", ""),
                        numberIn(*address, "posts"), textIn(*address, "lastError", "none"),
@@ -163,13 +151,11 @@ std::string formatDuration(double seconds) {
 std::string formatStatus(const Dictionary& status, double now) {
   std::string out;
   if (const Dictionary* daemon = status.dictionary("daemon")) addDaemon(out, *daemon);
-  const Array& sessions = arrayIn(status, "sessions");
+  const auto sessions = dictionariesIn(status, "sessions");
   out += sessions.empty() ? "\n\nNo session is open." : "\n\nSessions";
-  for (const Value& session : sessions) {
-    if (const Dictionary* dictionary = session.asDictionary()) addSession(out, *dictionary, "  ");
-  }
-  addStorebags(out, arrayIn(status, "storebags"), now);
-  addServers(out, arrayIn(status, "servers"), now);
+  for (const Dictionary* session : sessions) addSession(out, *session, "  ");
+  addStorebags(out, status, now);
+  addServers(out, status, now);
   if (const Dictionary* spool = status.dictionary("spool")) addSpool(out, *spool, now);
   return out;
 }

@@ -1,17 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// Follows the record as it is written.
+// `veltractl watch`: follows the record as it is written.
 #include <fmt/format.h>
 
 #include <chrono>
 #include <set>
 
 #include "formats/json.h"
+#include "tools/ctl/commands.h"
 #include "tools/ctl/contents_source.h"
 #include "tools/ctl/fate_lines.h"
 #include "tools/ctl/fate_source.h"
 #include "tools/ctl/fate_text.h"
 #include "tools/ctl/print.h"
-#include "tools/ctl/why_command.h"
+#include "tools/null_value.h"
 
 namespace veltrad::ctl {
 
@@ -54,7 +55,7 @@ class Watcher final : public support::FateReader::Listener {
     const std::uint64_t message = step.message & ~wire::kNoMessage;
     Dictionary line = lineOfStep(step);
     line.merge({{"event", "step"}, {"message", message}});
-    line.set("backend", backend.empty() ? nullValue() : Value(backend));
+    line.set("backend", backend.empty() ? tools::nullValue() : Value(backend));
     print(line, textOfStep(step, fmt::format("{}{}{}", message, backend.empty() ? "" : " ", backend)));
   }
 
@@ -86,7 +87,7 @@ class Watcher final : public support::FateReader::Listener {
     }
     for (const char* key : {"payload", "userInfo"}) {
       const Dictionary* held = contents ? contents->dictionary(key) : nullptr;
-      line.set(key, held ? Value(*held) : nullValue());
+      line.set(key, held ? Value(*held) : tools::nullValue());
       if (held) text += fmt::format("\n  {} {}", key, formats::writeJSON(*held));
     }
   }
@@ -105,15 +106,10 @@ class Watcher final : public support::FateReader::Listener {
 
 }  // namespace
 
-int runWatch(const Options& options, Interrupt& interrupt) {
-  auto daemon = ControlClient::connect(options.root);
-  if (!daemon) {
-    complain(daemon.error());
-    return 1;
-  }
-  ContentsSource contents(daemon.value());
+int runWatch(ControlClient& daemon, const Options& options, Interrupt& interrupt) {
+  ContentsSource contents(daemon);
   Watcher watcher(options, options.care.contents ? &contents : nullptr);
-  FateSource source(daemon.value(), watcher);
+  FateSource source(daemon, watcher);
   const auto readOn = [&](bool patient) {
     auto done = source.readOn(patient);
     // Also those that nobody asks for, so that others are not lost behind them.

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads the whole record and prints what is asked for.
-#include "tools/ctl/why_command.h"
+// `veltractl why`: reads the whole record and prints what is asked for.
+#include "tools/ctl/commands.h"
 
 #include <fmt/format.h>
 
@@ -72,20 +72,12 @@ bool print(const support::MessageFates& fates, const Options& options) {
 
 }  // namespace
 
-int runWhy(const Options& options) {
-  auto daemon = ControlClient::connect(options.root);
-  if (!daemon) {
-    complain(daemon.error());
-    return 1;
-  }
+int runWhy(ControlClient& daemon, const Options& options) {
   support::FateBook book;
-  FateSource source(daemon.value(), book);
+  FateSource source(daemon, book);
   auto done = source.readOn(true);
   if (done && source.waits()) done = source.readOn(false);
-  if (!done) {
-    complain(done.error());
-    return 1;
-  }
+  if (!done) return refused(done.error());
   const Story story = storyOf(book, source, options);
   if (!printGone(story.gone, options.json)) return 1;
   for (const support::MessageFates* fates : story.told) {
