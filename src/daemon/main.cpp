@@ -130,6 +130,7 @@ void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord
   }
   kept.emplace(std::move(record).value());
   services.counters.countIn(kept->counts());
+  services.allowance.countIn(kept->counts().day);
   if (const auto lost = services.counters.value(wire::Reason::daemon_ended)) {
     logInfo("main: the daemon before this one was killed, and %llu events are lost",
             static_cast<unsigned long long>(lost));
