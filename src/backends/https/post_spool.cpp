@@ -5,7 +5,6 @@
 #include <time.h>
 
 #include <algorithm>
-#include <future>
 #include <new>
 #include <utility>
 
@@ -225,11 +224,7 @@ std::size_t PostSpool::sendNow() {
 }
 
 bool PostSpool::drain(Deadline deadline) {
-  const auto done = std::make_shared<std::promise<void>>();
-  auto written = done->get_future();
-  using Put = platform::DiskWriter::Queue::Put;
-  return _jobs.put([done] { done->set_value(); }, 1) == Put::taken &&
-         written.wait_until(deadline) == std::future_status::ready;
+  return _jobs.run([] {}, deadline);
 }
 
 // By the disk writer, so that nothing is written meanwhile.
