@@ -98,10 +98,9 @@ Result<Dictionary, std::string> spoolPage(PostSpool* spool, const Dictionary& ar
     if (bytes > kMostListedBytes) break;
     after = name.order;
     const auto entry = spool->read(name).entry;
-    SpoolQueue::AddressStatus address;
-    const auto place = spool->queue().place(name.order, address);
+    const auto place = spool->queue().place(name.order);
     if (!entry || !place) continue;  // it has left
-    posts.push_back(lineOfPost(*entry, *place, address));
+    posts.push_back(lineOfPost(*entry, *place, spool->queue().statusAt(place->address)));
     bytes += keptBytes(posts.back());
   }
   Dictionary page{{"posts", std::move(posts)}};
