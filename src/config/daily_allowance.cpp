@@ -78,7 +78,9 @@ void DailyAllowance::beginDay() {
 
 std::string DailyAllowance::text() const {
   const Lock held(_mutex);
-  return formats::writeJSON(Dictionary{{"day", _account->day}, {"events", _account->events}, {"bytes", _account->bytes}}) + "\n";
+  return formats::writeJSON(
+             Dictionary{{"day", _account->day}, {"events", _account->events}, {"bytes", _account->bytes}}) +
+         "\n";
 }
 
 std::uint64_t DailyAllowance::version() const {

@@ -51,8 +51,7 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, Message m
   return result;
 }
 
-void flushBackends(const BackendSet* backends, support::MessageLog& messageLog,
-                   wire::FlushReply completion) {
+void flushBackends(const BackendSet* backends, support::MessageLog& messageLog, wire::FlushReply completion) {
   if (!backends) {
     const char* text = "No backends available to send message";
     logDebug("internalFlushMessagesWithCompletion: %s", text);

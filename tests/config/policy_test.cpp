@@ -188,8 +188,11 @@ TEST(DailyAllowance, GoesOnWithTheRecordOfADaemonThatWasKilled) {
   };
   const std::tuple<platform::DayAccount, std::string, std::uint64_t> rows[] = {
       // what stands in the record, in the file, and what may still leave
-      {{today, 6, 1}, file(4), 3},      {{today, 6, 1}, "", 3}, {{today, 4, 1}, file(6), 3},
-      {{today - 1, 9, 1}, file(2), 7}, {{}, file(9), 0}};
+      {{today, 6, 1}, file(4), 3},
+      {{today, 6, 1}, "", 3},
+      {{today, 4, 1}, file(6), 3},
+      {{today - 1, 9, 1}, file(2), 7},
+      {{}, file(9), 0}};
   for (auto [record, text, left] : rows) {
     files.put("/daily", text);
     config::DailyAllowance day(files, clock, "/daily");

@@ -335,7 +335,7 @@ void PostSpool::writeAgain(const support::SpoolEntry& post) {
     now.tries = place->tries;
     now.lastError = _queue.statusAt(place->address).lastError;
     const std::string bytes = support::writeSpoolEntry(now);
-    if (_folder.rewrite(name, bytes)) _queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()));
+    if (_folder.write(name, bytes)) _queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()));
   }
   // It may have been dropped meanwhile.
   if (!_queue.holds(post.order)) _removals.remove(name);
