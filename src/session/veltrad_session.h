@@ -27,7 +27,6 @@
 namespace veltrad::session {
 
 class Aggregation;
-class FlushCounters;
 class VeltradSessionDelegate;
 struct FamilyFacts;
 struct Message;
@@ -41,7 +40,6 @@ struct SessionServices {
   platform::Preferences& preferences;
   platform::Locale& locale;
   platform::Counters& counters;
-  FlushCounters& flushes;
   support::MessageLog& messageLog;
   const config::OwnerGate& gate;
   // Null: what becomes of messages is not recorded.

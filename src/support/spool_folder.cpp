@@ -96,10 +96,6 @@ Result<Done, std::string> SpoolFolder::write(const Name& name, std::string_view 
   return Failure{std::move(written.error().description)};
 }
 
-bool SpoolFolder::rewrite(const Name& name, std::string_view file) const {
-  return _files.replace(pathOf(name), file, 0600).ok();
-}
-
 SpoolFolder::Read SpoolFolder::read(const Name& name) const {
   try {
     Read found = readFile(name);
