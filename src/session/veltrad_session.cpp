@@ -296,7 +296,7 @@ void VeltradSession::sayWithoutUserInfo() {
 void VeltradSession::flushMessagesWithCompletion(wire::FlushReply completion) {
   logDebug("flushMessagesWithCompletion: Flushing messages for session %u", _sessionID);
   hearOwner();
-  flushBackends(_backends.get(), _services.messageLog, std::move(completion));
+  flushBackends(_backends.get(), _services.flushes, _services.messageLog, std::move(completion));
 }
 
 void VeltradSession::uploadFileAtPath(std::string path, std::string extensionToken,

@@ -27,6 +27,7 @@
 namespace veltrad::session {
 
 class Aggregation;
+class FlushCounters;
 class VeltradSessionDelegate;
 struct FamilyFacts;
 struct Message;
@@ -40,6 +41,7 @@ struct SessionServices {
   platform::Preferences& preferences;
   platform::Locale& locale;
   platform::Counters& counters;
+  FlushCounters& flushes;
   support::MessageLog& messageLog;
   const config::OwnerGate& gate;
   // Null: what becomes of messages is not recorded.
