@@ -2,14 +2,11 @@
 // Makes the JSON of `veltractl why` and `watch`.
 #include "tools/ctl/fate_lines.h"
 
-#include "tools/null_value.h"
+#include "base/null_value.h"
 
 namespace veltrad::ctl {
 
 namespace {
-
-using tools::nullValue;
-using tools::orNull;
 
 template <typename T>
 Value valueIfKnown(std::uint8_t known, std::uint8_t which, T value) {

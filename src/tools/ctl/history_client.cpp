@@ -4,8 +4,8 @@
 
 #include <map>
 
+#include "base/null_value.h"
 #include "tools/ctl/answer_fields.h"
-#include "tools/null_value.h"
 #include "wire/names.h"
 
 namespace veltrad::ctl {
@@ -20,17 +20,17 @@ constexpr const char* kEndKeys[] = {"status", "error", "transmissions"};
 
 HistoryItem itemOf(const Dictionary& record) {
   HistoryItem item;
-  for (const char* key : kKeys) item.facts.set(key, tools::orNull(record.find(key)));
-  for (const char* key : {"status", "error"}) item.facts.set(key, tools::nullValue());
+  for (const char* key : kKeys) item.facts.set(key, orNull(record.find(key)));
+  for (const char* key : {"status", "error"}) item.facts.set(key, nullValue());
   item.facts.set("transmissions", 1);
   item.headers = arrayIn(record, "headers");
-  item.day = tools::orNull(record.find("day"));
-  item.offset = tools::orNull(record.find("offset"));
+  item.day = orNull(record.find("day"));
+  item.offset = orNull(record.find("offset"));
   const std::string* digest = record.string("sha256");
   if (digest) item.digest = *digest;
   if (!record.boolean("kept").value_or(true)) {
     item.facts.set("kept", false);
-    item.facts.set("sha256", tools::orNull(record.find("sha256")));
+    item.facts.set("sha256", orNull(record.find("sha256")));
     if (!digest) item.digest = "unknown";
   }
   return item;
@@ -57,8 +57,7 @@ Result<std::vector<HistoryItem>, std::string> askForHistory(ControlClient& daemo
         places[*id] = items.size();
         items.push_back(itemOf(*record));
       } else if (const auto begun = end ? places.find(*end) : places.end(); begun != places.end()) {
-        for (const char* key : kEndKeys)
-          items[begun->second].facts.set(key, tools::orNull(record->find(key)));
+        for (const char* key : kEndKeys) items[begun->second].facts.set(key, orNull(record->find(key)));
       }
     }
     const Dictionary* following = page.value().dictionary("next");

@@ -5,6 +5,7 @@
 #include <chrono>
 #include <set>
 
+#include "base/null_value.h"
 #include "formats/json.h"
 #include "tools/ctl/commands.h"
 #include "tools/ctl/contents_source.h"
@@ -12,7 +13,6 @@
 #include "tools/ctl/fate_source.h"
 #include "tools/ctl/fate_text.h"
 #include "tools/ctl/print.h"
-#include "tools/null_value.h"
 
 namespace veltrad::ctl {
 
@@ -55,7 +55,7 @@ class Watcher final : public support::FateReader::Listener {
     const std::uint64_t message = step.message & ~wire::kNoMessage;
     Dictionary line = lineOfStep(step);
     line.merge({{"event", "step"}, {"message", message}});
-    line.set("backend", backend.empty() ? tools::nullValue() : Value(backend));
+    line.set("backend", backend.empty() ? nullValue() : Value(backend));
     print(line, textOfStep(step, fmt::format("{}{}{}", message, backend.empty() ? "" : " ", backend)));
   }
 
@@ -87,7 +87,7 @@ class Watcher final : public support::FateReader::Listener {
     }
     for (const char* key : {"payload", "userInfo"}) {
       const Dictionary* held = contents ? contents->dictionary(key) : nullptr;
-      line.set(key, held ? Value(*held) : tools::nullValue());
+      line.set(key, held ? Value(*held) : nullValue());
       if (held) text += fmt::format("\n  {} {}", key, formats::writeJSON(*held));
     }
   }

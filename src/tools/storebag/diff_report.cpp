@@ -2,14 +2,11 @@
 // Says changes as JSON and to people.
 #include <fmt/format.h>
 
+#include "base/null_value.h"
 #include "storebag/storebag_diff.h"
-#include "tools/null_value.h"
 
 namespace veltrad::storebag {
 namespace {
-
-using tools::nullValue;
-using tools::orNull;
 
 std::string pathOf(const ChangePlace& at) {
   std::string path = at.section.value_or("");

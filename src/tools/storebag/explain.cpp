@@ -5,18 +5,16 @@
 #include "backends/dashboard/packet_text.h"
 #include "backends/dashboard/udp_socket.h"
 #include "backends/https/https_post_backend.h"
+#include "base/null_value.h"
 #include "config/client_types.h"
 #include "config/storebag_section.h"
 #include "storebag/dry_run.h"
 #include "storebag/explanation.h"
 #include "storebag/silence.h"
-#include "tools/null_value.h"
 #include "wire/constants.h"
 
 namespace veltrad::storebag {
 namespace {
-
-using tools::nullValue;
 
 using backends::SharedProfile;
 using config::ClientEntry;

@@ -2,16 +2,13 @@
 // Says an explanation as JSON and to people.
 #include <fmt/format.h>
 
+#include "base/null_value.h"
 #include "formats/json.h"
 #include "storebag/explanation.h"
 #include "storebag/words.h"
-#include "tools/null_value.h"
 
 namespace veltrad::storebag {
 namespace {
-
-using tools::nullValue;
-using tools::orNull;
 
 template <typename List>
 Array arrayOf(const List& items) {
