@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "base/text.h"
+#include "tools/ctl/option_kinds.h"
 
 namespace veltrad::ctl {
 
@@ -24,28 +25,24 @@ CLI::App* addCommand(CLI::App& app, Options& options, Command command, const std
 
 namespace {
 
+std::string clientTypeProblem(const std::string& text) {
+  std::int32_t type = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), type);
+  if (error == std::errc() && end == text.data() + text.size() && type >= 0) return {};
+  return fmt::format("expected a client type, 0 to 17, found \"{}\"", escapedForLog(text));
+}
+
 void addDoctor(CLI::App& app, Options& options) {
   CLI::App* doctor =
       addCommand(app, options, Command::doctor, "doctor",
                  "Check everything that stands between this device and its first report", kCareGroup);
-  const auto add = [&options](const std::string& text) {
-    std::int32_t type = 0;
-    const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), type);
-    if (error != std::errc() || end != text.data() + text.size() || type < 0) {
-      throw CLI::ValidationError(
-          "--client-type", fmt::format("expected a client type, 0 to 17, found \"{}\"", escapedForLog(text)));
-    }
-    options.care.clientTypes.push_back(type);
-  };
   doctor
-      ->add_option_function<std::vector<std::string>>(
-          "--client-type",
-          [add](const std::vector<std::string>& texts) {
-            for (const std::string& text : texts) add(text);
-          },
+      ->add_option(
+          "--client-type", options.care.clientTypes,
           "Look at this client type's storebag; repeat the option for more. Without it at those that\n"
           "sessions have asked for since the start, else at all")
-      ->type_name("N");
+      ->type_name("N")
+      ->check(CLI::Validator(clientTypeProblem, ""));
   doctor->footer(
       "Prints each check with ok, warning, failure or skipped, and what to do. The exit status is 1 exactly "
       "if\n"
@@ -59,16 +56,12 @@ void addConfig(CLI::App& app, Options& options) {
                                 "Show or change the preferences that the system reads", kCareGroup);
   config->require_subcommand(0, 1);
   const auto addKey = [&](CLI::App* command) {
-    command->add_option("key", care.key, "Name of a preference, as `veltractl config` shows it")
-        ->type_name("")
-        ->required();
+    addArgument(*command, "key", care.key, "Name of a preference, as `veltractl config` shows it");
   };
   addKey(addCommand(*config, options, Command::configGet, "get", "Print the value alone"));
   CLI::App* set = addCommand(*config, options, Command::configSet, "set", "Store a value");
   addKey(set);
-  set->add_option("value", care.value, "true, false, a number, or a text, as the key's type says")
-      ->type_name("")
-      ->required();
+  addArgument(*set, "value", care.value, "true, false, a number, or a text, as the key's type says");
   addKey(addCommand(*config, options, Command::configUnset, "unset",
                     "Take a value away; the default holds again"));
   config->footer(
@@ -110,10 +103,8 @@ void addSpool(CLI::App& app, Options& options) {
   addCommand(*spool, options, Command::spool, "list", "The same as without a command");
   addCommand(*spool, options, Command::spoolSend, "send",
              "Send them now: no address waits, whatever its server has asked for");
-  addCommand(*spool, options, Command::spoolDrop, "drop", "Remove posts for good, unsent")
-      ->add_option("id", options.care.ids, "Posts, as `veltractl spool` shows them")
-      ->type_name("")
-      ->required();
+  addArgument(*addCommand(*spool, options, Command::spoolDrop, "drop", "Remove posts for good, unsent"), "id",
+              options.care.ids, "Posts, as `veltractl spool` shows them");
   spool->footer(
       "Kept only if \"spool\" in etc/veltrad/settings.json says so. Oldest first; with --json one object a "
       "line.\n\nExamples:\n  veltractl spool\n  veltractl spool send");

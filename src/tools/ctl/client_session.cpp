@@ -77,24 +77,14 @@ ClientSession::~ClientSession() {
 }
 
 std::optional<std::string> ClientSession::open(const std::optional<std::string>& root,
-                                               const Identity& identity) {
-  const auto userInfo = nodeOf(identity.userInfo);
-  veltra_session_options options = optionsOf(identity, userInfo);
+                                               const std::optional<Identity>& identity) {
+  if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
+  const Identity described = identity.value_or(Identity());
+  const auto userInfo = nodeOf(described.userInfo);
+  veltra_session_options options = optionsOf(described, userInfo);
+  options.undescribed = !identity;
   options.aggregated = _aggregated ? &ClientSession::aggregated : nullptr;
   options.aggregated_context = this;
-  return create(options, root);
-}
-
-std::optional<std::string> ClientSession::openUndescribed(const std::optional<std::string>& root) {
-  veltra_session_options options;
-  veltra_session_options_init(&options);
-  options.undescribed = true;
-  return create(options, root);
-}
-
-std::optional<std::string> ClientSession::create(veltra_session_options& options,
-                                                 const std::optional<std::string>& root) {
-  if (_arrived.get() < 0) return std::string("cannot make an event descriptor: ") + std::strerror(errno);
   options.root = root ? root->c_str() : nullptr;
   options.state_changed = &ClientSession::stateChanged;
   options.state_context = this;

@@ -27,9 +27,9 @@ class ClientSession {
   ~ClientSession();
 
   // Connects. Returns a text that says what is wrong, if anything is. Without a root uses the environment's.
-  std::optional<std::string> open(const std::optional<std::string>& root, const Identity& identity);
-  // Like open(), for a session without session info, which only makes sendOneShot() calls.
-  std::optional<std::string> openUndescribed(const std::optional<std::string>& root);
+  // Without an identity only sendOneShot() calls may follow.
+  std::optional<std::string> open(const std::optional<std::string>& root,
+                                  const std::optional<Identity>& identity);
 
   std::optional<Answer> start();
   // `message` has "category", "type", "payload" and "flag".
@@ -52,7 +52,6 @@ class ClientSession {
 
  private:
   using Call = std::function<veltra_status(veltra_session*, veltra_callback, void*)>;
-  std::optional<std::string> create(veltra_session_options& options, const std::optional<std::string>& root);
   std::optional<Answer> await(const Call& call, const Progress& progress = nullptr);
   // Called on the library's thread.
   bool lostForLong();

@@ -4,7 +4,7 @@
 
 #include <CLI/CLI.hpp>
 
-#include "tools/ctl/number_option.h"
+#include "tools/ctl/option_kinds.h"
 #include "wire/fates.h"
 
 namespace veltrad::ctl {

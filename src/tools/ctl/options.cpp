@@ -11,7 +11,7 @@
 #include "base/text.h"
 #include "config/preference_keys.h"
 #include "tools/ctl/command_options.h"
-#include "tools/ctl/number_option.h"
+#include "tools/ctl/option_kinds.h"
 #include "tools/key_value.h"
 #include "veltra/veltra.h"
 #include "wire/constants.h"
@@ -179,19 +179,15 @@ void addQuestions(CLI::App& app, Options& options, Texts& texts) {
 
 void addUploads(CLI::App& app, Options& options, Texts& texts) {
   CLI::App* file = addCommand(app, options, Command::upload, "upload", "Upload a file");
-  file->add_option("file", options.file, "A regular file; it is removed once the server has confirmed it")
-      ->type_name("")
-      ->required();
+  addArgument(*file, "file", options.file, "A regular file; it is removed once the server has confirmed it");
   addIdentity(*file, options.identity, texts, true);
   file->footer(
       "Waits for the server and prints the result. The exit status is 1 if the file was not uploaded.\n\n"
       "Example:\n  veltractl upload --client-type 7 crash.log");
   CLI::App* logData =
       addCommand(app, options, Command::uploadLogData, "upload-log-data", "Upload an array of log data");
-  logData
-      ->add_option("file", options.file, "The array as JSON; {\"$date\": …} and {\"$data\": …} as in session")
-      ->type_name("")
-      ->required();
+  addArgument(*logData, "file", options.file,
+              "The array as JSON; {\"$date\": …} and {\"$data\": …} as in session");
   addIdentity(*logData, options.identity, texts, true);
   logData->footer(
       "Waits for the servers. The exit status is 1 if no server accepted the data.\n\n"

@@ -2,7 +2,7 @@
 // Describes the commands for the owner of a device.
 #include "tools/ctl/command_options.h"
 
-#include <CLI/CLI.hpp>
+#include "tools/ctl/option_kinds.h"
 
 namespace veltrad::ctl {
 namespace {
@@ -35,7 +35,7 @@ void addHistory(CLI::App& app, Options& options) {
       ->type_name("FILE");
   CLI::App* show = addCommand(*history, options, Command::historyShow, "show",
                               "Print the headers and the readable body of one record");
-  show->add_option("id", care.key, "A record, as `veltractl history` shows it")->type_name("")->required();
+  addArgument(*show, "id", care.key, "A record, as `veltractl history` shows it");
   show->add_flag("--raw", care.raw, "Print the bytes as they left, and nothing else");
   addCommand(*history, options, Command::historyPurge, "purge",
              "Remove all of it for good, and say how much");

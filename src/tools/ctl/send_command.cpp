@@ -90,9 +90,8 @@ int runOneCall(const Options& options, Interrupt& interrupt) {
     logData = std::move(read).value();
   }
   const bool oneShot = options.command == Command::oneShot;
-  if (const auto problem =
-          oneShot ? session.openUndescribed(options.root) : session.open(options.root, options.identity))
-    return refused(*problem);
+  const auto identity = oneShot ? std::nullopt : std::optional(options.identity);
+  if (const auto problem = session.open(options.root, identity)) return refused(*problem);
   if (!oneShot) {
     const auto started = session.start();
     if (!started || started->status != VELTRA_OK) return failed(started);

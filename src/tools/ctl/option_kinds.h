@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Options of veltractl that take a number.
+// Options and arguments that several commands of veltractl have.
 #pragma once
 
 #include <fmt/format.h>
@@ -38,6 +38,12 @@ CLI::Option* addNumber(CLI::App& command, const std::string& name, T& target, co
     target = number;
   };
   return command.add_option_function<std::string>(name, read, help)->type_name("N");
+}
+
+// One that the command needs.
+template <typename T>
+CLI::Option* addArgument(CLI::App& command, const std::string& name, T& target, const std::string& help) {
+  return command.add_option(name, target, help)->type_name("")->required();
 }
 
 }  // namespace veltrad::ctl
