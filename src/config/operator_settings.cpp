@@ -16,7 +16,7 @@ using enum Need;
 constexpr Range kRingBytes{64 << 10, 256 << 20};
 constexpr Range kSpoolBytes{1 << 20, 1e15};
 constexpr Range kPace{0.001, 1'000};
-constexpr Range kShare{0, 1};
+constexpr Range kJitter{0, 1};
 constexpr Range kWait{0.05, 86'400};
 
 constexpr auto kStorebagChoiceKeys = keysOf<StorebagChoices>({
@@ -82,7 +82,7 @@ constexpr auto kSettingsKeys = keysOf<OperatorChoices>({
     row<&OperatorChoices::compression>({"compression", dictionary, kUnbounded, optional, "as its keys say",
                                         "How event posts are compressed.", &CompressionChoices::kKeys}),
     row<&OperatorChoices::jitter>(
-        {"jitter", real, kShare, optional, "0",
+        {"jitter", real, kJitter, optional, "0",
          "Share by which the times between fetches of a storebag are spread, so that devices do not ask at "
          "once: up to that share of its refresh cycle sooner, or of it later than 900 seconds after a "
          "failure. "

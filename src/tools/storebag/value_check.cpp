@@ -9,6 +9,7 @@
 #include <charconv>
 #include <cmath>
 #include <iterator>
+#include <utility>
 
 #include "base/text.h"
 #include "storebag/address_check.h"
@@ -214,7 +215,7 @@ class ValueCheck {
         fmt::format("\"{}\" holds {}, and country codes have capital letters: {}", _key.name, quoted(name),
                     isThreshold ? "this threshold is never used"
                                 : "here case does not matter, in \"country\" it does"),
-        fmt::format("Write {}.", quoted(capital)));
+        fmt::format("Write {}.", quoted(std::as_const(capital))));
   }
 
   void checkAddress(const std::string& address, bool lab) const {
