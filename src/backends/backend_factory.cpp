@@ -9,7 +9,6 @@
 #include "backends/sampling_factors.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
-#include "platform/random.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {

@@ -16,6 +16,7 @@
 #include "platform/lent_files.h"
 #include "platform/locale.h"
 #include "platform/preferences.h"
+#include "platform/random.h"
 #include "support/device_identity.h"
 #include "support/veltra.h"
 
