@@ -54,7 +54,7 @@ Daemon::Daemon(Services& services)
       _storebags(services.http, _settings, _library, _storebagTrust, _choices, _storebagStore,
                  services.counters),
       _agent({_factory, _device, _library, services.clock, services.preferences, services.locale,
-              services.counters, _messageLog, services.gate, &_fates},
+              services.counters, _flushes, _messageLog, services.gate, &_fates},
              _storebags, services.transaction),
       _follower(_agent, _choices),
       _privacy(services, _agent, _factory, _library, spool()) {}

@@ -20,6 +20,7 @@
 #include "daemon/storebag_follower.h"
 #include "daemon/veltrad_agent.h"
 #include "platform/fate_ring.h"
+#include "session/flush_counters.h"
 #include "support/device_identity.h"
 #include "support/message_log.h"
 #include "support/veltra.h"
@@ -27,7 +28,7 @@
 namespace veltrad::daemon {
 
 // The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 20 fields are these objects, in the order in which they need each other, whatever the padding.
+// 21 fields are these objects, in the order in which they need each other, whatever the padding.
 // NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding)
 class Daemon {
  public:
@@ -63,6 +64,7 @@ class Daemon {
   backends::SamplingFactors _sampling;
   std::optional<backends::PostSpool> _spool;
   support::MessageLog _messageLog;
+  session::FlushCounters _flushes;
   backends::BackendFactory _factory;
   config::StorebagStore _storebagStore;
   config::SeenStorebagsFile _seenStorebags;

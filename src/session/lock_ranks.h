@@ -4,5 +4,5 @@
 
 #include "base/mutex.h"
 
-#define PENDING_FLUSH_LOCK LOCK_OF_RANK(40)
+#define FLUSH_COUNTERS_LOCK LOCK_OF_RANK(40)
 #define SESSION_LOCK LOCK_OF_RANK(50)

@@ -4,7 +4,7 @@
 
 #include "base/text.h"
 #include "platform/log.h"
-#include "session/pending_flush.h"
+#include "session/flush_counters.h"
 #include "session/session_delegate.h"
 #include "wire/constants.h"
 
@@ -51,7 +51,8 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, Message m
   return result;
 }
 
-void flushBackends(const BackendSet* backends, support::MessageLog& messageLog, wire::FlushReply completion) {
+void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::MessageLog& messageLog,
+                   wire::FlushReply completion) {
   if (!backends) {
     const char* text = "No backends available to send message";
     logDebug("internalFlushMessagesWithCompletion: %s", text);
@@ -62,15 +63,15 @@ void flushBackends(const BackendSet* backends, support::MessageLog& messageLog, 
     if (completion) completion(std::nullopt, std::nullopt);
     return;
   }
-  const auto flush = std::make_shared<PendingFlush>(backends->size(), std::move(completion));
+  const auto flush = flushes.begin(backends->size(), std::move(completion));
   for (const auto& [name, backend] : *backends) {
     // Must not refer to the session or the back end: it may run on the HTTP thread after both have gone.
     backend->flushMessagesWithCompletion(
-        [&messageLog, flush, key = name, own = backend->name()](
+        [&flushes, &messageLog, flush, key = name, own = backend->name()](
             const std::optional<std::string>& answer, const std::optional<wire::ReportingError>& error) {
           logDebug("internalFlushMessagesWithCompletion: %s", own.c_str());
           if (answer) messageLog.writeToLogFile("[%@ -> flushMessages] %@", key, *answer);
-          flush->finished(answer, error);
+          flushes.finished(*flush, answer, error);
         });
   }
 }

@@ -13,6 +13,7 @@
 
 namespace veltrad::session {
 
+class FlushCounters;
 class VeltradSessionDelegate;
 
 struct Message {
@@ -45,7 +46,8 @@ std::optional<std::string> offerToBackends(const BackendSet& backends, Message m
                                            support::MessageLog& messageLog, wire::Outcomes* outcomes);
 
 // Calls `completion`, which may be empty, once: at the first error, or when all back ends have answered.
-void flushBackends(const BackendSet* backends, support::MessageLog& messageLog, wire::FlushReply completion);
+void flushBackends(const BackendSet* backends, FlushCounters& flushes, support::MessageLog& messageLog,
+                   wire::FlushReply completion);
 
 // These return whether a back end uploaded the data. `backends` may be null.
 bool uploadFile(const BackendSet* backends, const std::string& path, const std::string& extensionToken,

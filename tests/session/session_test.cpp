@@ -84,10 +84,11 @@ class Session : public testing::Test {
   config::OwnerGate gate{policy, world.preferences, secret, day};
   platform::DiskWriter writer;
   support::MessageLog messages{world.clock, "/nowhere", writer, world.counters};
+  session::FlushCounters flushes;
   Daemon daemon;
   const std::shared_ptr<session::VeltradSession> session = session::VeltradSession::initWithSessionDelegate(
       {world.factory, world.device, world.library, world.clock, world.preferences, world.locale,
-       world.counters, messages, gate},
+       world.counters, flushes, messages, gate},
       daemon, std::make_shared<Client>());
 };
 

@@ -311,7 +311,8 @@ SpoolQueue::AddressStatus SpoolQueue::statusOf(std::uint16_t address) const {
 std::vector<SpoolQueue::AddressStatus> SpoolQueue::addresses() const {
   std::vector<AddressStatus> all;
   const Lock held(_mutex);
-  for (std::uint16_t address = 0; address < _waits.size(); ++address) {
+  for (std::size_t i = 0; i < _waits.size(); ++i) {
+    const auto address = static_cast<std::uint16_t>(i);
     if (_index.postsAt(address) > 0 && _index.address(address) != kNoAddress)
       all.push_back(statusOf(address));
   }

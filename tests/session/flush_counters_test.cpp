@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Flushes that wait for several back ends: which answer is the one, and that nobody is called under the lock.
-#include "session/pending_flush.h"
+#include "session/flush_counters.h"
 
 #include <gtest/gtest.h>
 
@@ -18,7 +18,7 @@ struct Case {
   std::size_t calledBy;  // which answer, from 1; 0: none
 };
 
-TEST(PendingFlush, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
+TEST(FlushCounters, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
   for (const Case& c : std::vector<Case>{{1, {"a"}, 1},
                                          {1, {std::nullopt}, 1},
                                          {3, {"a", "b"}, 0},
@@ -27,16 +27,17 @@ TEST(PendingFlush, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
                                          {2, {"!a", "!b"}, 1},
                                          {2, {"a", "!b"}, 2},
                                          {1, {"a", "late", "!later"}, 1}}) {
+    session::FlushCounters counters;
     std::vector<Text> given;
-    session::PendingFlush flush(c.backends, [&](const Text& answer, const auto& error) {
+    const auto flush = counters.begin(c.backends, [&](const Text& answer, const auto& error) {
       given.push_back(error ? "!" + error->description : answer);
-      // Takes a lock of the same rank: a call under it would abort here.
-      session::PendingFlush(1, nullptr).finished(std::nullopt, std::nullopt);
+      // Takes the same lock: a call under it would abort here.
+      counters.finished(*counters.begin(1, nullptr), std::nullopt, std::nullopt);
     });
     for (std::size_t i = 0; i < c.answers.size(); ++i) {
       const bool error = c.answers[i] && c.answers[i]->starts_with('!');
-      flush.finished(
-          error ? std::nullopt : c.answers[i],
+      counters.finished(
+          *flush, error ? std::nullopt : c.answers[i],
           error ? std::optional(wire::makeReportingError(c.answers[i]->substr(1), -1)) : std::nullopt);
       EXPECT_EQ(given.size(), c.calledBy > 0 && i + 1 >= c.calledBy ? 1u : 0u);
     }
@@ -44,7 +45,8 @@ TEST(PendingFlush, TheFirstErrorOrTheLastAnswerIsGivenOnce) {
       EXPECT_EQ(given.at(0), c.answers[c.calledBy - 1]);
     }
   }
-  session::PendingFlush(1, nullptr).finished("a", std::nullopt);  // nobody waits
+  session::FlushCounters counters;  // nobody waits
+  counters.finished(*counters.begin(1, nullptr), "a", std::nullopt);
 }
 
 }  // namespace
