@@ -22,13 +22,6 @@ constexpr const char* kOther = "other";
 constexpr std::int64_t kSecondsOfAnHour = 3'600;
 constexpr std::int64_t kHours = 24;
 
-// "https://a.example:8443/x" → "https://a.example:8443"
-std::string_view addressOf(std::string_view url) {
-  const std::size_t host = url.find("//");
-  url = url.substr(0, url.find_first_of("/?#", host == std::string_view::npos ? 0 : host + 2));
-  return url.substr(0, http::kMostOfAddress);
-}
-
 }  // namespace
 
 std::int64_t Destinations::hour() const {
@@ -51,7 +44,7 @@ void Destinations::count(http::Departure::Kind kind, std::string_view to, std::u
   using Kind = http::Departure::Kind;
   constexpr Column kColumnOf[] = {Column::events, datagrams, files, logData};
   static_assert(static_cast<int>(Kind::logData) == 3);
-  const std::string_view address = addressOf(to);
+  const std::string_view address = http::addressOf(to).substr(0, http::kMostOfAddress);
   const std::int64_t now = hour();
   const Lock held(_mutex);
   if (_hours.empty() || _hours.rbegin()->first != now) forgetOld();
