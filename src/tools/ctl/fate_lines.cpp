@@ -3,7 +3,6 @@
 #include "tools/ctl/fate_lines.h"
 
 #include <cmath>
-#include <limits>
 
 namespace veltrad::ctl {
 
@@ -77,10 +76,6 @@ Dictionary lineOfBackend(const support::BackendFate& fate, const std::vector<sup
   return line;
 }
 }  // namespace
-
-Value nullValue() {
-  return std::numeric_limits<double>::quiet_NaN();
-}
 
 double secondsOf(std::int64_t time) {
   return static_cast<double>(time) / 1e6;

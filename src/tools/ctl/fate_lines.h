@@ -2,7 +2,7 @@
 // What became of messages, for programs. Pure functions.
 #pragma once
 
-#include "base/value.h"
+#include "base/null_value.h"
 #include "support/fate_book.h"
 
 namespace veltrad::ctl {
@@ -13,8 +13,6 @@ Dictionary lineOfMessage(const support::ToldMessage& message);
 Dictionary lineOfFates(const support::MessageFates& fates);
 // "time", "step" and what else is known of a step.
 Dictionary lineOfStep(const support::ToldStep& step);
-// Printed as null.
-Value nullValue();
 // Seconds since 1970.
 double secondsOf(std::int64_t time);
 

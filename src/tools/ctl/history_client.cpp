@@ -2,9 +2,9 @@
 // Asks for page after page, and joins the two records of what left.
 #include "tools/ctl/history_client.h"
 
-#include <limits>
 #include <map>
 
+#include "base/null_value.h"
 #include "wire/names.h"
 
 namespace veltrad::ctl {
@@ -19,7 +19,7 @@ constexpr const char* kEndKeys[] = {"status", "error", "transmissions"};
 
 Value fieldOrNull(const Dictionary& from, const char* key) {
   const Value* value = from.find(key);
-  return value ? *value : Value(std::numeric_limits<double>::quiet_NaN());
+  return value ? *value : nullValue();
 }
 
 HistoryItem itemOf(const Dictionary& record) {

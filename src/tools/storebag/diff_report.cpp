@@ -2,7 +2,7 @@
 // Says changes as JSON and to people.
 #include <fmt/format.h>
 
-#include "storebag/null_value.h"
+#include "base/null_value.h"
 #include "storebag/storebag_diff.h"
 
 namespace veltrad::storebag {
@@ -45,7 +45,7 @@ Dictionary changeAsDictionary(const Change& change) {
 }
 
 Value messagesAsValue(const std::optional<MessageChanges>& messages) {
-  if (!messages) return unknownValue();
+  if (!messages) return nullValue();
   Array list;
   for (const ChangedMessage& one : messages->changed)
     list.emplace_back(Dictionary{{"line", one.line}, {"was", one.was}, {"is", one.is}});

@@ -6,11 +6,11 @@
 #include "backends/dashboard/packet_text.h"
 #include "backends/dashboard/udp_socket.h"
 #include "backends/https/https_post_backend.h"
+#include "base/null_value.h"
 #include "config/client_types.h"
 #include "config/storebag_section.h"
 #include "storebag/dry_run.h"
 #include "storebag/explanation.h"
-#include "storebag/null_value.h"
 #include "storebag/silence.h"
 #include "wire/constants.h"
 
@@ -27,7 +27,7 @@ constexpr std::uint32_t kReleaseEnvironment = 4;
 constexpr const char* kFactsOfARun[] = {"_startTS",   "_clientTS",       "eventTime",
                                         "_sessionID", "_timezoneOffset", "_reportVers"};
 
-const Value kUnknown = unknownValue();
+const Value kUnknown = nullValue();
 
 bool isContainer(const Value& value) {
   return value.asArray() || value.asDictionary() || value.asData();

@@ -2,9 +2,9 @@
 // Says an explanation as JSON and to people.
 #include <fmt/format.h>
 
+#include "base/null_value.h"
 #include "formats/json.h"
 #include "storebag/explanation.h"
-#include "storebag/null_value.h"
 #include "storebag/words.h"
 
 namespace veltrad::storebag {
@@ -71,7 +71,7 @@ std::string backendText(const std::string& name, const BackendExplanation& told)
 }  // namespace
 
 Dictionary asDictionary(const BackendExplanation& told) {
-  Value nearest = unknownValue();
+  Value nearest = nullValue();
   if (told.match.nearest)
     nearest = Dictionary{{"entry", *told.match.nearest}, {"differs", arrayOf(differencesOf(told.match))}};
   Array events;
