@@ -16,6 +16,8 @@ constexpr std::size_t kMostOfAddress = 300;
 // parser, so that nobody's idea of an address differs from where the request goes.
 std::string hostName(const std::string& url);
 // Scheme, host and, where it is given, port, as the URL has them: "https://h.example:8443".
-std::string addressOf(std::string_view url);
+std::string_view addressOf(std::string_view url);
+// The same without the scheme.
+std::string_view authorityOf(std::string_view url);
 
 }  // namespace veltrad::http

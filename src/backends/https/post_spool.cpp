@@ -74,7 +74,7 @@ void PostSpool::wake() {
 }
 
 std::optional<std::string> PostSpool::admit(SpooledPost& post) {
-  auto admission = _queue.admit(http::addressOf(post.entry.url), post.entry.connection);
+  auto admission = _queue.admit(std::string(http::addressOf(post.entry.url)), post.entry.connection);
   post.entry.order = admission.order;
   post.emptied = admission.emptied;
   return std::move(admission.refusal);
@@ -82,7 +82,7 @@ std::optional<std::string> PostSpool::admit(SpooledPost& post) {
 
 void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result) {
   support::SpoolEntry& entry = post->entry;
-  const std::string address = http::addressOf(entry.url);
+  const std::string address(http::addressOf(entry.url));
   entry.tries = static_cast<std::uint16_t>(triesOf(result));
   if (isToBeKept(result)) {
     entry.lastError = outcomeOf(result);
@@ -97,7 +97,8 @@ void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTP
 
 void PostSpool::keep(const std::shared_ptr<SpooledPost>& post) {
   const support::SpoolEntry& entry = post->entry;
-  if (!_queue.add(placeOf(entry, post->fate), http::addressOf(entry.url), entry.uid, post->emptied)) {
+  if (!_queue.add(placeOf(entry, post->fate), std::string(http::addressOf(entry.url)), entry.uid,
+                  post->emptied)) {
     _counters.count(Reason::spool_refused_by_owner, entry.events);
     _notes.dropped(placeOf(entry, post->fate), Reason::refused_by_owner);
     return recordUnsent(entry, entry.tries);
@@ -277,7 +278,7 @@ void PostSpool::load(const Name& name, const Each& each) {
   if (!entry) return;
   support::SpoolPlace place = placeOf(*entry, 0);
   place.bytes = bytes;
-  _queue.addLoaded(place, http::addressOf(entry->url), entry->uid, entry->lastError);
+  _queue.addLoaded(place, std::string(http::addressOf(entry->url)), entry->uid, entry->lastError);
   each(name, *entry);
 }
 

@@ -26,7 +26,7 @@ void SpoolNotes::record(const support::SpoolEntry& post, int transmissions, http
                                   std::make_shared<const Dictionary>(post.client),
                                   post.about};
   end.transmissions = transmissions;
-  const std::string host = http::addressOf(post.url).substr(std::string_view("https://").size());
+  const std::string host(http::authorityOf(post.url));
   auto lines = http::sentLines(host, http::headerLines(post.headers, post.body.size()));
   _gate.ended(_gate.record(departure, std::move(lines), post.body, nullptr), end);
 }

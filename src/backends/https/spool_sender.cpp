@@ -77,8 +77,7 @@ void SpoolSender::stop() {
 }
 
 void SpoolSender::wake() {
-  const std::uint64_t one = 1;
-  if (::write(_news.get(), &one, sizeof one) < 0) return;  // it is awake
+  ::eventfd_write(_news.get(), 1);  // fails only if it is awake
 }
 
 void SpoolSender::run() {
@@ -239,8 +238,8 @@ void SpoolSender::wait(double seconds) {
   const double whole = std::floor(std::max(0.0, seconds));
   const timespec most{static_cast<time_t>(whole), static_cast<long>((std::max(0.0, seconds) - whole) * 1e9)};
   ::ppoll(events.data(), events.size(), &most, nullptr);
-  std::uint64_t count = 0;
-  if (::read(_news.get(), &count, sizeof count) < 0) return;  // the time is over
+  eventfd_t count = 0;
+  ::eventfd_read(_news.get(), &count);  // fails if the time is over
 }
 
 }  // namespace veltrad::backends

@@ -2,7 +2,7 @@
 // What became of messages, for programs. Pure functions.
 #pragma once
 
-#include "base/value.h"
+#include "base/null_value.h"
 #include "support/fate_book.h"
 
 namespace veltrad::ctl {
