@@ -12,6 +12,9 @@
 
 namespace veltrad::backends {
 
+VeltraBackend::VeltraBackend(std::string name, std::string productFamily, platform::Random& random)
+    : _name(std::move(name)), _productFamily(std::move(productFamily)), _samplingFactor(random.uniform()) {}
+
 std::string VeltraBackend::convertIntoSHA256(std::string_view text) {
   unsigned char digest[32];
   unsigned length = 0;

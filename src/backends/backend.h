@@ -21,6 +21,7 @@
 #include "platform/clock.h"
 #include "platform/counters.h"
 #include "platform/fate_pen.h"
+#include "platform/random.h"
 #include "wire/error.h"
 #include "wire/fates.h"
 #include "wire/reasons.h"
@@ -77,7 +78,7 @@ struct NumberedMessage {
   MessageNote note = {};
 };
 
-// One back end of one session. It outlives its session only while its own work is under way. Its 14 fields
+// One back end of one session. It outlives its session only while its own work is under way. Its 15 fields
 // are what every kind has: what it is, how it stands, what it knows of its session, and what is told of it.
 class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  public:
@@ -119,6 +120,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
   // Constant after construction.
   const std::string& name() const { return _name; }
+  const std::string& productFamily() const { return _productFamily; }
   // In [0, 1), drawn once.
   double samplingFactor() const { return _samplingFactor; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
@@ -162,8 +164,8 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  protected:
   // Drops and counts the events and datagrams that wait. Any thread.
   virtual void dropWaiting() {}
-  VeltraBackend(std::string name, double samplingFactor)
-      : _name(std::move(name)), _samplingFactor(samplingFactor) {}
+  // Draws the sampling factor.
+  VeltraBackend(std::string name, std::string productFamily, platform::Random& random);
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
   // The session's thread.
   virtual ClientMatch clientMatch() const { return {}; }
@@ -179,6 +181,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
 
   // Constant after construction.
   const std::string _name;
+  const std::string _productFamily;
   const double _samplingFactor;
   std::optional<std::string> _displayURL;
   platform::FatePen _pen;

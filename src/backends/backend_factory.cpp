@@ -16,16 +16,22 @@ namespace veltrad::backends {
 namespace {
 // Devices of this product type have no adaptor.
 [[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
+
+// The one draw that a back end takes, decided before.
+class FixedDraw final : public platform::Random {
+ public:
+  explicit FixedDraw(double draw) : _draw(draw) {}
+  double uniform() override { return _draw; }
+
+ private:
+  const double _draw;
+};
 }  // namespace
 
-std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(const std::string& name,
-                                                                  const SharedProfile& profile,
-                                                                  const SharedFacts& facts, bool oneShot,
-                                                                  const std::optional<double>& draw) {
-  const auto known = draw                 ? draw
-                     : _services.sampling ? _services.sampling->stableFactor(facts->compType, name)
-                                          : std::nullopt;
-  auto made = make(name, profile, *facts, oneShot, known ? *known : _services.random.uniform());
+std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(
+    const std::string& name, const SharedProfile& profile, const std::optional<std::string>& productFamily,
+    const SharedFacts& facts, bool oneShot, const std::optional<double>& draw) {
+  auto made = make(name, profile, productFamily, *facts, oneShot, draw);
   if (!made) return nullptr;
   made->setFacts(facts);
   made->keepFates(_services.fates);
@@ -33,39 +39,46 @@ std::shared_ptr<VeltraBackend> BackendFactory::newBackendWithName(const std::str
 }
 
 std::shared_ptr<VeltraBackend> BackendFactory::make(const std::string& name, const SharedProfile& profile,
+                                                    const std::optional<std::string>& productFamily,
                                                     const SessionFacts& facts, [[maybe_unused]] bool oneShot,
-                                                    double draw) {
+                                                    const std::optional<double>& draw) {
+  const std::string family = productFamily.value_or("");
+  const auto known = draw                 ? draw
+                     : _services.sampling ? _services.sampling->stableFactor(facts.compType, name)
+                                          : std::nullopt;
+  FixedDraw fixed(known.value_or(0));
+  platform::Random& random = known ? fixed : _services.random;
 #ifdef VELTRA_DASHBOARD
   if (name == wire::kVeltraBackendDashboard) {
     return DashboardBackend::initWithName(
-        {draw, _services.clock, _services.counters, _services.pool, _logData, _dashboards, facts.account,
+        {random, _services.clock, _services.counters, _services.pool, _logData, _dashboards, facts.account,
          oneShot, _services.gate, _services.fates},
-        name, std::get_if<config::DashboardProfile>(profile.get()));
+        name, std::get_if<config::DashboardProfile>(profile.get()), family);
   }
 #endif
   if (name == wire::kVeltraBackendUploadServer) {
     return UploadBackend::initWithName(
-        {draw, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
-        name, std::get_if<config::UploadProfile>(profile.get()));
+        {random, _files, _services.http, _services.lentFiles, _services.counters, _services.scratchDirectory},
+        name, std::get_if<config::UploadProfile>(profile.get()), family);
   }
   if (name == wire::kVeltraBackendHTTPPost || name == wire::kVeltraBackendHTTPPost2) {
-    if (!facts.device.productFamily) return nullptr;
-    return HTTPSPostBackend::initWithName({draw,
-                                           _services.locale,
-                                           _services.counters,
-                                           _posts,
-                                           {_services.fates, name},
-                                           {_services.preferences, _services.library, _services.settings},
-                                           _services.gate},
-                                          name,
-                                          {profile, std::get_if<config::HTTPSPostProfile>(profile.get())});
+    return HTTPSPostBackend::initWithName(
+        {random,
+         _services.locale,
+         _services.counters,
+         _posts,
+         {_services.fates, name},
+         {_services.preferences, _services.library, _services.settings},
+         _services.gate},
+        name, {profile, std::get_if<config::HTTPSPostProfile>(profile.get())}, productFamily);
   }
   if (name == wire::kVeltraBackendAmpery) {
-    return AmperyBackend::initWithName(_services.energyLog, _services.counters, draw, name);
+    return AmperyBackend::initWithName(_services.energyLog, _services.counters, random, name, family);
   }
 #ifdef VELTRA_ADAPTOR
   if (name == wire::kVeltraBackendMivo && !_services.device.mayHaveProductType(kProductTypeWithoutMivo)) {
-    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, draw, name, facts.compType);
+    return MivoBackend::initWithName(_services.adaptorBundle, _services.counters, random, name, family,
+                                     facts.compType);
   }
 #endif
   logError("VeltraBackend(newBackendWithName): %s", name.c_str());

@@ -73,6 +73,7 @@ class BackendFactory {
   // is not sufficient. `oneShot`: the back end serves a single message instead of a session. `draw`: its
   // sampling factor, if it is not to draw one.
   std::shared_ptr<VeltraBackend> newBackendWithName(const std::string& name, const SharedProfile& profile,
+                                                    const std::optional<std::string>& productFamily,
                                                     const SharedFacts& facts, bool oneShot = false,
                                                     const std::optional<double>& draw = std::nullopt);
   // The one reason for which a kind of back end is not made, other than that something was short.
@@ -90,7 +91,9 @@ class BackendFactory {
 
  private:
   std::shared_ptr<VeltraBackend> make(const std::string& name, const SharedProfile& profile,
-                                      const SessionFacts& facts, bool oneShot, double draw);
+                                      const std::optional<std::string>& productFamily,
+                                      const SessionFacts& facts, bool oneShot,
+                                      const std::optional<double>& draw);
 
   const BackendServices _services;
   EventPosts _posts;

@@ -23,8 +23,6 @@ struct DeviceFacts {
   std::optional<std::string> productVersion;
   std::optional<std::string> buildVersion;
   std::optional<std::string> hardwareType;
-  // Without it there are no HTTPS post back ends.
-  std::optional<std::string> productFamily;
   bool isInternal = false;
 };
 

@@ -36,7 +36,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   facts.device.productVersion = making.device.deviceProductVersion();
   facts.device.buildVersion = making.device.deviceBuildVersion();
   facts.device.hardwareType = making.device.deviceProductType();
-  facts.device.productFamily = making.device.deviceName();
+  const auto productFamily = making.device.deviceName();
   facts.device.isInternal = making.device.isInternalBuild();
   facts.selfVersion = backends::SelfVersion::of(making.library.packageVersion());
   facts.sessionID = sessionInfo->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
@@ -63,7 +63,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
     }
     backends::VeltraBackend* before = named(making.before, name);
     auto backend =
-        making.factory.newBackendWithName(name, profile, shared, making.oneShot,
+        making.factory.newBackendWithName(name, profile, productFamily, shared, making.oneShot,
                                           before ? std::optional(before->samplingFactor()) : std::nullopt);
     if (!backend) {
       notMade(name, backends::BackendFactory::whyNotMade(name));

@@ -6,18 +6,21 @@
 
 #include <thread>
 
+#include "fakes/machine.h"
+
 namespace veltrad {
 namespace {
 
 struct Counting final : backends::VeltraBackend {
-  Counting() : backends::VeltraBackend("x", 0) {}
+  explicit Counting(platform::Random& random) : backends::VeltraBackend("x", "", random) {}
   backends::Sent sendNumberedMessage(backends::NumberedMessage&& message) override {
     return {{}, std::to_string(message.eventID)};
   }
 };
 
 TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
-  const auto backend = std::make_shared<Counting>();
+  FakeRandom random;
+  const auto backend = std::make_shared<Counting>(random);
   EXPECT_EQ(backend->sendMessage(std::nullopt, {}, 0, 0, 0).text, "1");
   for (int i = 2; i < 65'536; ++i) backend->sendMessage(std::nullopt, {}, 0, 0, 0);
   EXPECT_EQ(backend->sendMessage(std::nullopt, {}, 0, 0, 0).text, "0");
@@ -33,7 +36,8 @@ TEST(VeltraBackend, NumbersMessagesAndParsesVersions) {
 
 // User info comes from the session's own thread, the combined session ID from any: neither undoes the other.
 TEST(VeltraBackend, ItsFactsChangeAsAWholeAndOnlyWhereTheyAreToldTo) {
-  Counting backend;
+  FakeRandom random;
+  Counting backend(random);
   auto facts = std::make_shared<backends::SessionFacts>();
   facts->sessionID = 7;
   backend.setFacts(facts);

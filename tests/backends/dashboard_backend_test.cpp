@@ -7,6 +7,8 @@
 #include <filesystem>
 
 #include "backends/dashboard/dashboard_backend.h"
+#include "backends/dashboard/dashboard_queues.h"
+#include "backends/dashboard/log_data_uploads.h"
 #include "base/file_descriptor.h"
 #include "fakes/few_descriptors.h"
 #include "fakes/recorded_log.h"
@@ -56,7 +58,7 @@ class Dashboard : public ::testing::Test {
     backends::SessionFacts facts;
     facts.account = std::move(account);
     return configured(
-        world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile),
+        world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop",
                                          std::make_shared<const backends::SessionFacts>(std::move(facts))));
   }
   // A message that nobody acknowledges, and the end of its back end.
@@ -85,12 +87,22 @@ class Dashboard : public ::testing::Test {
 };
 
 TEST_F(Dashboard, ThePacketToTheByteAndTheLineToTheBlank) {
+  backends::LogDataUploads uploads(world.http, world.counters);
+  const backends::DashboardMaking making{world.random,
+                                         world.clock,
+                                         world.counters,
+                                         world.pool,
+                                         uploads,
+                                         std::make_shared<backends::DashboardQueues>(),
+                                         {}};
+  const auto direct =
+      backends::DashboardBackend::initWithName(making, "direct", "127.0.0.1"s, server.port, "Desktop");
   const std::pair<std::shared_ptr<backends::VeltraBackend>, char> cases[] = {
-      {make({{"reliable", 60'000}}), 1}, {make(), 0}};
+      {make({{"reliable", 60'000}}), 1}, {make(), 0}, {configured(direct), 3}};
   const Dictionary payload{{"codec", "opus with 18 chars"}};
   for (const auto& [backend, flags] : cases) {
     const auto [decision, line] = backend->sendNumberedMessage({payload, kTime, 1, 0, 5, 0});
-    EXPECT_EQ(decision.fate, flags == 1 ? wire::Fate::waiting : wire::Fate::sent);
+    EXPECT_EQ(decision.fate, (flags & 1) ? wire::Fate::waiting : wire::Fate::sent);
     EXPECT_EQ(server.receive(), "\x02\x07\x01\x1E\x53\x72\x4E\x00\xFF\xFF\xED\xCB\xFF\xFC\xFF\xA6\0\1\0\0"s +
                                     kDevice + "\0\5\0"s + flags + " codec=opus with 18 chars");
     EXPECT_EQ(line, "1400000000.120 " + kDevice +
@@ -168,7 +180,7 @@ TEST_F(Dashboard, LingeringOnesMakeRoomForADescriptorAndForMemory) {
   for (int i = 0; i < 3; ++i) made.push_back(make({}, account));
   log.expectLine(Level::error, "DashboardBackend(initWithName): socket() failed (24)");
   const Dictionary profile{{"ip", "127.0.0.1"}, {"port", 9}};
-  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile),
+  EXPECT_EQ(world.factory.newBackendWithName(wire::kVeltraBackendDashboard, parsed(profile), "Desktop",
                                              std::make_shared<const backends::SessionFacts>()),
             nullptr);
 }

@@ -42,7 +42,7 @@ TEST(SamplingFactors, AreDrawnUnlessChosenOtherwiseAndTheSecretIsThere) {
   auto facts = std::make_shared<backends::SessionFacts>();
   facts->compType = 7;
   const auto factor = [&] {
-    return factory.newBackendWithName("ampery", nullptr, facts, false)->samplingFactor();
+    return factory.newBackendWithName("ampery", nullptr, "Elm", facts, false)->samplingFactor();
   };
   EXPECT_EQ(factor(), world.random.draw);
   EXPECT_FALSE(world.files.bytes(path));

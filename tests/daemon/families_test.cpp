@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "backends/backend.h"
+#include "fakes/machine.h"
 #include "fakes/recorded_log.h"
 #include "ipc/connection.h"
 #include "wire/constants.h"
@@ -46,13 +47,13 @@ struct Client final : ipc::Connection {
 };
 
 struct Reporting final : backends::VeltraBackend {
-  explicit Reporting(const char* name) : VeltraBackend(name, 0) {}
+  Reporting(const char* name, platform::Random& random) : VeltraBackend(name, "", random) {}
 };
 
 // "A0": ID A, level 0. Then, in any order: "@name" another client than "phone", "!" aggregates, "=1" its back
 // end's own state (2), "-" lacks the back end that the others have.
 struct Session {
-  explicit Session(const std::string& text) : id(text.substr(0, 1)) {
+  Session(const std::string& text, platform::Random& random) : id(text.substr(0, 1)) {
     std::istringstream rest(text.substr(1));
     int level = 0;
     rest >> level;
@@ -66,11 +67,11 @@ struct Session {
       if (sign == '!') aggregation->setActive(true);
     }
     // The first back end gives the level; the state of the second one is checked.
-    const auto leading = std::make_shared<Reporting>("leading");
+    const auto leading = std::make_shared<Reporting>("leading", random);
     leading->setHierarchy(level);
     set->emplace(wire::kVeltraBackendHTTPPost, leading);
     if (!lacks) {
-      backend = std::make_shared<Reporting>(wire::kVeltraBackendDashboard);
+      backend = std::make_shared<Reporting>(wire::kVeltraBackendDashboard, random);
       backend->setState({state, wire::Reason::reports});
       backend->setSamplingThreshold(id[0]);
       backends::SessionFacts facts;
@@ -110,7 +111,7 @@ struct Session {
 class World {
  public:
   Session& join(const std::string& text) {
-    Session& session = *_sessions.emplace_back(std::make_unique<Session>(text));
+    Session& session = *_sessions.emplace_back(std::make_unique<Session>(text, _random));
     refresh(session);
     return session;
   }
@@ -140,6 +141,7 @@ class World {
   daemon::Families families;
 
  private:
+  FakeRandom _random;
   std::vector<std::unique_ptr<Session>> _sessions;
 };
 

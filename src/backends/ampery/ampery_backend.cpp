@@ -13,9 +13,14 @@ constexpr const char* kEnergyLogEvent = "Sonvaird-VLT";
 }  // namespace
 
 std::shared_ptr<AmperyBackend> AmperyBackend::initWithName(EnergyLog& energyLog, platform::Counters& counters,
-                                                           double samplingFactor, const std::string& name) {
-  return std::shared_ptr<AmperyBackend>(new AmperyBackend(energyLog, counters, samplingFactor, name));
+                                                           platform::Random& random, const std::string& name,
+                                                           const std::string& productFamily) {
+  return std::shared_ptr<AmperyBackend>(new AmperyBackend(energyLog, counters, random, name, productFamily));
 }
+
+AmperyBackend::AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,
+                             const std::string& name, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, random), _energyLog(energyLog), _counters(counters) {}
 
 Sent AmperyBackend::sendNumberedMessage(NumberedMessage&& message) {
   if (const auto forbidden = prohibition()) {

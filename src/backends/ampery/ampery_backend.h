@@ -16,15 +16,15 @@ class EnergyLog;
 class AmperyBackend final : public VeltraBackend {
  public:
   static std::shared_ptr<AmperyBackend> initWithName(EnergyLog& energyLog, platform::Counters& counters,
-                                                     double samplingFactor, const std::string& name);
+                                                     platform::Random& random, const std::string& name,
+                                                     const std::string& productFamily);
 
   // The event is the payload with "method", "respCode" and "event" (the event ID) set. Returns no text.
   Sent sendNumberedMessage(NumberedMessage&& message) override;
 
  private:
-  AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, double samplingFactor,
-                const std::string& name)
-      : VeltraBackend(name, samplingFactor), _energyLog(energyLog), _counters(counters) {}
+  AmperyBackend(EnergyLog& energyLog, platform::Counters& counters, platform::Random& random,
+                const std::string& name, const std::string& productFamily);
 
   EnergyLog& _energyLog;
   platform::Counters& _counters;

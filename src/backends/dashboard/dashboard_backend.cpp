@@ -23,11 +23,12 @@ namespace {
 constexpr std::chrono::milliseconds kDefaultPeriod{500};
 constexpr std::int32_t kMicrosecondsPerFraction = 4000;
 
-bool namesServer(const config::DashboardProfile* profile) {
-  const bool hasIP = profile && profile->ip;
-  if (hasIP && profile->port) return true;
-  logError("DashboardBackend(initWithName): can't resolve server %s", hasIP ? "port" : "IP");
-  return false;
+bool namesServer(const config::DashboardProfile& profile) {
+  const bool named = profile.ip && profile.port;
+  if (!named) {
+    logError("DashboardBackend(initWithName): can't resolve server %s", profile.ip ? "port" : "IP");
+  }
+  return named;
 }
 
 // If descriptors are short, ends queues that linger.
@@ -63,9 +64,11 @@ struct Server {
   }
 };
 
-Server serverOf(const config::DashboardProfile& profile) {
-  const auto [reliable, asked] = profile.reliable;
-  return {parseIPv4Address(*profile.ip, *profile.port), reliable,
+Server serverOf(const config::DashboardProfile* profile, const std::optional<std::string>& serverIP,
+                std::uint16_t serverPort) {
+  if (!profile) return {serverIP ? parseIPv4Address(*serverIP, serverPort) : std::nullopt};
+  const auto [reliable, asked] = profile->reliable;
+  return {parseIPv4Address(*profile->ip, *profile->port), reliable,
           asked > 0 ? std::chrono::milliseconds(asked) : kDefaultPeriod};
 }
 
@@ -109,32 +112,52 @@ std::shared_ptr<NetworkProcQueue> openQueue(const DashboardMaking& making, UDPSo
 
 std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
                                                                  const std::string& name,
-                                                                 const config::DashboardProfile* profile) {
-  if (!namesServer(profile)) {
+                                                                 const config::DashboardProfile* profile,
+                                                                 const std::string& productFamily) {
+  return initWithName(making, name, profile, std::nullopt, 0, productFamily);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(const DashboardMaking& making,
+                                                                 const std::string& name,
+                                                                 const std::optional<std::string>& serverIP,
+                                                                 std::uint16_t serverPort,
+                                                                 const std::string& productFamily) {
+  if (!serverIP) return nullptr;
+  return initWithName(making, name, nullptr, serverIP, serverPort, productFamily);
+}
+
+std::shared_ptr<DashboardBackend> DashboardBackend::initWithName(
+    const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
+    const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily) {
+  if (profile && !namesServer(*profile)) {
     making.counters.count(wire::Reason::bad_address);
     return nullptr;
   }
-  const Server server = serverOf(*profile);
+  const Server server = serverOf(profile, serverIP, serverPort);
   auto queue =
       making.oneShot && server.address ? making.queues->join(server.routeOf(making.account.get())) : nullptr;
   auto socket = queue ? std::nullopt : openSocket(*making.queues);
-  if (!queue && socket) queue = openQueue(making, std::move(*socket), server);
-  if (!queue) return nullptr;
-  return std::shared_ptr<DashboardBackend>(new DashboardBackend(making, name, *profile, std::move(queue)));
+  if (!queue && !socket) return nullptr;
+  std::shared_ptr<DashboardBackend> backend(new DashboardBackend(making, name, profile, productFamily));
+  if (profile) backend->setDisplayURL(profile->displayURL);
+  if (!profile && !serverIP) {
+    logError("DashboardBackend(initWithName): initWitName with all null params.");
+    return nullptr;
+  }
+  if (!queue) queue = openQueue(making, std::move(*socket), server);
+  backend->_networkProcQueue = std::move(queue);
+  return backend->_networkProcQueue ? backend : nullptr;
 }
 
 DashboardBackend::DashboardBackend(const DashboardMaking& making, const std::string& name,
-                                   const config::DashboardProfile& profile,
-                                   std::shared_ptr<NetworkProcQueue> queue)
-    : VeltraBackend(name, making.samplingFactor),
+                                   const config::DashboardProfile* profile, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.random),
       _uploads(making.uploads),
       _clock(making.clock),
       _counters(making.counters),
-      _postURL(profile.postURL),
-      _gate(making.gate),
-      _networkProcQueue(std::move(queue)) {
-  setDisplayURL(profile.displayURL);
-}
+      _usingProfile(profile != nullptr),
+      _postURL(profile ? profile->postURL : std::nullopt),
+      _gate(making.gate) {}
 
 DatagramOwner DashboardBackend::owner(const MessageNote& note, const SessionFacts& facts) const {
   if (!_gate || !_gate->keepsRecords()) return {facts.client, {}};
@@ -194,7 +217,8 @@ tagReportingPacketHeader DashboardBackend::headerOf(const NumberedMessage& messa
   std::memcpy(header.deviceID, udid.data(), std::min(udid.size(), sizeof header.deviceID));
   header.eventID = htobe16(message.eventID);
   header.flags =
-      htobe16(static_cast<std::uint16_t>(_networkProcQueue->reliableUDP() ? kPacketFlagReliable : 0));
+      htobe16(static_cast<std::uint16_t>((_networkProcQueue->reliableUDP() ? kPacketFlagReliable : 0) |
+                                         (_usingProfile ? 0 : kPacketFlagNoProfile)));
   return header;
 }
 
@@ -229,7 +253,8 @@ MessageNote DashboardBackend::notedMessage(const Dictionary& payload, platform::
 }
 
 void DashboardBackend::cleanup() {
-  if (!std::exchange(_cleanedUp, true)) _networkProcQueue->cleanup();
+  if (!_networkProcQueue || std::exchange(_cleanedUp, true)) return;
+  _networkProcQueue->cleanup();
 }
 
 }  // namespace veltrad::backends

@@ -21,7 +21,7 @@ class WorkPool;
 
 // What a dashboard back end uses, and the account that pays for what it keeps. The references outlive it.
 struct DashboardMaking {
-  double samplingFactor;
+  platform::Random& random;
   platform::Clock& clock;
   platform::Counters& counters;
   WorkPool& pool;
@@ -33,15 +33,26 @@ struct DashboardMaking {
   platform::FateRing* fates = nullptr;
 };
 
+// The initialisers return null, after one error line, if the back end cannot work.
 class DashboardBackend final : public VeltraBackend {
  public:
   // From a storebag's section: "ip" (dotted-decimal IPv4), "port" and optionally "display_url", "post_url"
   // (for log data) and "reliable". The presence of "reliable" requests acknowledgements; its value is the
-  // period of the ticks in milliseconds, 500 if it is below 1. Null, after one error line, if the back end
-  // cannot work.
+  // period of the ticks in milliseconds, 500 if it is below 1.
   static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
                                                         const std::string& name,
-                                                        const config::DashboardProfile* profile);
+                                                        const config::DashboardProfile* profile,
+                                                        const std::string& productFamily);
+  // To the given server, with acknowledgements and a period of 500 ms.
+  static std::shared_ptr<DashboardBackend> initWithName(const DashboardMaking& making,
+                                                        const std::string& name,
+                                                        const std::optional<std::string>& serverIP,
+                                                        std::uint16_t serverPort,
+                                                        const std::string& productFamily);
+  // A profile takes precedence over the given server.
+  static std::shared_ptr<DashboardBackend> initWithName(
+      const DashboardMaking& making, const std::string& name, const config::DashboardProfile* profile,
+      const std::optional<std::string>& serverIP, std::uint16_t serverPort, const std::string& productFamily);
   ~DashboardBackend() override;
 
   // The text is the dashboard text line of the message.
@@ -56,7 +67,7 @@ class DashboardBackend final : public VeltraBackend {
   void dropWaiting() override;
 
   DashboardBackend(const DashboardMaking& making, const std::string& name,
-                   const config::DashboardProfile& profile, std::shared_ptr<NetworkProcQueue> queue);
+                   const config::DashboardProfile* profile, const std::string& productFamily);
 
   tagReportingPacketHeader headerOf(const NumberedMessage& message, const SessionFacts& facts) const;
   MessageNote notedMessage(const Dictionary& payload, platform::TimeValue now, wire::FateRef session) const;
@@ -65,9 +76,10 @@ class DashboardBackend final : public VeltraBackend {
   LogDataUploads& _uploads;
   platform::Clock& _clock;
   platform::Counters& _counters;
+  const bool _usingProfile;
   const std::optional<std::string> _postURL;
   config::OwnerGate* const _gate;
-  const std::shared_ptr<NetworkProcQueue> _networkProcQueue;
+  std::shared_ptr<NetworkProcQueue> _networkProcQueue;
 
   // The session's thread only.
   bool _cleanedUp = false;

@@ -38,5 +38,7 @@ static_assert(sizeof(tagReportingPacket) == 1088 && offsetof(tagReportingPacket,
 
 inline constexpr std::uint8_t kPacketKind = 1;
 inline constexpr std::uint16_t kPacketFlagReliable = 1;
+// The server was not taken from a storebag section.
+inline constexpr std::uint16_t kPacketFlagNoProfile = 2;
 
 }  // namespace veltrad::backends

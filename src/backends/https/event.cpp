@@ -50,8 +50,8 @@ void limitRoom(std::string& text) {
   if (text.capacity() > text.size() + kMostSpare) text.shrink_to_fit();
 }
 
-void addFixedFields(EventWriter& writer, const SessionFacts& facts, const NumberedMessage& message,
-                    int timeZoneOffset) {
+void addFixedFields(EventWriter& writer, const SessionFacts& facts, const std::string& productFamily,
+                    const NumberedMessage& message, int timeZoneOffset) {
   const DeviceFacts& device = facts.device;
   const std::int32_t startTS = coarsenedStart(facts.startTimeStamp);
   const double clientTS =
@@ -63,7 +63,7 @@ void addFixedFields(EventWriter& writer, const SessionFacts& facts, const Number
   writer.add("_internal", 3u);
   writer.add("_method", unsigned{message.method});
   if (device.productVersion) writer.add("_osVersion", std::string_view(*device.productVersion));
-  if (device.productFamily) writer.add("_productFamily", std::string_view(*device.productFamily));
+  writer.add("_productFamily", std::string_view(productFamily));
   if (device.hardwareType) writer.add("_productModel", std::string_view(*device.hardwareType));
   writer.add("_reportVers", std::string_view(versionText(facts.selfVersion)));
   writer.add("_sender", std::string_view(senderCode(facts.compType)));
@@ -96,8 +96,9 @@ void changeEvent(EventText& event, const std::function<void(Dictionary&)>& chang
   event = eventText(*fields);
 }
 
-WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& message, int timeZoneOffset,
-                        const FilterTable& filters, std::size_t expectedBytes) {
+WrittenEvent writeEvent(const SessionFacts& facts, const std::string& productFamily,
+                        const NumberedMessage& message, int timeZoneOffset, const FilterTable& filters,
+                        std::size_t expectedBytes) {
   static const Dictionary kNone;
   const Dictionary& userInfo = facts.sentUserInfo ? *facts.sentUserInfo : kNone;
   const EventKind kind{numberIn(userInfo, "_method", message.method),
@@ -107,7 +108,7 @@ WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& messag
   {
     EventWriter writer(message.payload ? *message.payload : kNone, userInfo, filters, kind.method,
                        kind.status, event);
-    addFixedFields(writer, facts, message, timeZoneOffset);
+    addFixedFields(writer, facts, productFamily, message, timeZoneOffset);
     writer.finish();
   }
   limitRoom(event.text.json);

@@ -47,7 +47,8 @@ struct WrittenEvent {
 // "_internal", "_reportVers", "_timezoneOffset" (seconds from GMT). A field whose text is absent is left out.
 // Then the user info that may leave, which replaces fields of both; then the filters. `expectedBytes` may be
 // any number: if it is the length of the text, the buffer is allocated only once.
-WrittenEvent writeEvent(const SessionFacts& facts, const NumberedMessage& message, int timeZoneOffset,
-                        const FilterTable& filters, std::size_t expectedBytes);
+WrittenEvent writeEvent(const SessionFacts& facts, const std::string& productFamily,
+                        const NumberedMessage& message, int timeZoneOffset, const FilterTable& filters,
+                        std::size_t expectedBytes);
 
 }  // namespace veltrad::backends

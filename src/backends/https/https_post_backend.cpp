@@ -28,14 +28,15 @@ bool meansSamplingOverride(std::int32_t flag) {
 
 std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
     const HTTPSPostMaking& making, const std::string& name,
-    const std::shared_ptr<const config::HTTPSPostProfile>& profile) {
-  if (!profile) return nullptr;
+    const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+    const std::optional<std::string>& productFamily) {
+  if (!profile || !productFamily) return nullptr;
   if (!profile->clients) {
     logError("HTTPSPostBackend(initWithName): can't find the client list.");
     making.counters.count(wire::Reason::no_clients);
     return nullptr;
   }
-  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, profile));
+  std::shared_ptr<HTTPSPostBackend> made(new HTTPSPostBackend(making, name, profile, *productFamily));
   if (!made->_clientState.identity().known()) {
     logError("HTTPSPostBackend(initWithName): the device's identifiers cannot be read just now.");
     return nullptr;
@@ -44,8 +45,9 @@ std::shared_ptr<HTTPSPostBackend> HTTPSPostBackend::initWithName(
 }
 
 HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile)
-    : VeltraBackend(name, making.samplingFactor),
+                                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+                                   const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.random),
       _locale(making.locale),
       _counters(making.counters),
       _posts(making.posts),
@@ -132,8 +134,8 @@ Sent HTTPSPostBackend::sendNumberedMessage(NumberedMessage&& message) {
 WrittenEvent HTTPSPostBackend::writeEvent(const SessionFacts& facts, const NumberedMessage& message) {
   constexpr std::size_t kMoreOrLess = 64, kLongest = 8192;
   noteUserInfo(facts);
-  WrittenEvent event = backends::writeEvent(facts, message, _locale.timeZoneOffset(), _clientState.filters(),
-                                            _lastLength + kMoreOrLess);
+  WrittenEvent event = backends::writeEvent(facts, productFamily(), message, _locale.timeZoneOffset(),
+                                            _clientState.filters(), _lastLength + kMoreOrLess);
   _lastLength = std::min(event.text.json.size(), kLongest);
   count(event.filtered);
   _counters.count(wire::Reason::field_not_json, event.notJSON);

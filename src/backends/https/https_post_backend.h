@@ -24,7 +24,7 @@ class EventPosts;
 
 // What an HTTPS post back end uses. The references outlive it.
 struct HTTPSPostMaking {
-  double samplingFactor;
+  platform::Random& random;
   platform::Locale& locale;
   platform::Counters& counters;
   EventPosts& posts;
@@ -36,10 +36,11 @@ struct HTTPSPostMaking {
 
 class HTTPSPostBackend final : public VeltraBackend {
  public:
-  // Null without a profile or, after an error line, the profile's "clients".
+  // Null without a profile, a product family or, after an error line, the profile's "clients".
   static std::shared_ptr<HTTPSPostBackend> initWithName(
       const HTTPSPostMaking& making, const std::string& name,
-      const std::shared_ptr<const config::HTTPSPostProfile>& profile);
+      const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+      const std::optional<std::string>& productFamily);
 
   void takeOver(VeltraBackend& before) override;
   void updateState() override;
@@ -58,7 +59,8 @@ class HTTPSPostBackend final : public VeltraBackend {
   void dropWaiting() override;
 
   HTTPSPostBackend(const HTTPSPostMaking& making, const std::string& name,
-                   const std::shared_ptr<const config::HTTPSPostProfile>& profile);
+                   const std::shared_ptr<const config::HTTPSPostProfile>& profile,
+                   const std::string& productFamily);
 
   void addStopFields(Dictionary& payload, bool batching) const;
   void count(const FilterTable::Outcome& outcome) const;

@@ -65,17 +65,16 @@ StateVerdict HTTPSPostState::counted(std::int32_t state, wire::Reason reason) {
 StateVerdict HTTPSPostState::reportForClient(const config::ClientEntry& entry,
                                              const std::optional<std::string>& clientName,
                                              const std::optional<std::string>& serviceName) {
-  const auto facts = _backEnd.facts();
-  const ClientFacts client{_identity.consent(), _locale.countryCode(),
-                           facts->device.productFamily.value_or(""), facts->device.hardwareType,
-                           _backEnd.samplingFactor()};
-  const ClientVerdict verdict = decideOnClient(entry, client);
+  const auto country = _locale.countryCode();
+  const ClientVerdict verdict =
+      decideOnClient(entry, {_identity.consent(), country, _backEnd.productFamily(),
+                             _backEnd.facts()->device.hardwareType, _backEnd.samplingFactor()});
   _backEnd.setHierarchy(verdict.hierarchy);
   _identity.setDNUType(verdict.dnuType);
   if (verdict.filters) _filters.createFiltersFromArray(*verdict.filters);
-  if (verdict.samplingReached) takeSampling(verdict, client.country);
+  if (verdict.samplingReached) takeSampling(verdict, country);
   if (verdict.reason) {
-    logRefusal(entry, verdict, client);
+    logRefusal(entry, verdict, country);
     _counters.count(*verdict.reason);
   }
   const wire::Reason reason = verdict.reason.value_or(wire::Reason::reports);
@@ -96,7 +95,7 @@ StateVerdict HTTPSPostState::reportForClient(const config::ClientEntry& entry,
 }
 
 void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
-                                const ClientFacts& client) const {
+                                const std::optional<std::string>& country) const {
   const auto printed = [](const config::TextList& list) {
     return list.asGiven ? formats::writeJSON(*list.asGiven) : std::string("(null)");
   };
@@ -106,16 +105,18 @@ void HTTPSPostState::logRefusal(const config::ClientEntry& entry, const ClientVe
       break;
     case wire::Reason::country_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in country code list %s",
-               client.country.value_or("(null)").c_str(), printed(entry.localeWhitelist).c_str());
+               country ? country->c_str() : "(null)", printed(entry.localeWhitelist).c_str());
       break;
     case wire::Reason::device_not_listed:
       logDebug("HTTPSPostBackend(updateBackendState): (%s) isn't in device whitelist %s",
-               client.productFamily.c_str(), printed(entry.deviceWhitelist).c_str());
+               _backEnd.productFamily().c_str(), printed(entry.deviceWhitelist).c_str());
       break;
-    case wire::Reason::device_refused:
+    case wire::Reason::device_refused: {
+      const auto hardwareType = _backEnd.facts()->device.hardwareType;
       logDebug("HTTPSPostBackend(updateBackendState): (%s) is in device blacklist %s",
-               client.hardwareType.value_or("(null)").c_str(), printed(entry.deviceBlacklist).c_str());
+               hardwareType ? hardwareType->c_str() : "(null)", printed(entry.deviceBlacklist).c_str());
       break;
+    }
     case wire::Reason::no_filters:
       logWarning("HTTPSPostBackend(updateBackendState): filters are required.");
       break;

@@ -56,7 +56,7 @@ class HTTPSPostState {
   StateVerdict reportForClient(const config::ClientEntry& entry, const std::optional<std::string>& clientName,
                                const std::optional<std::string>& serviceName);
   void logRefusal(const config::ClientEntry& entry, const ClientVerdict& verdict,
-                  const ClientFacts& client) const;
+                  const std::optional<std::string>& country) const;
   void takeSampling(const ClientVerdict& verdict, const std::optional<std::string>& country);
   void resetBackendStateWithClient(const config::ClientEntry* entry);
 

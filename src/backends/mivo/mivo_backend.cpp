@@ -8,9 +8,10 @@
 namespace veltrad::backends {
 
 std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platform::Counters& counters,
-                                                       double samplingFactor, const std::string& name,
+                                                       platform::Random& random, const std::string& name,
+                                                       const std::string& productFamily,
                                                        std::int32_t clientType) {
-  std::shared_ptr<MivoBackend> backend(new MivoBackend(bundle, counters, samplingFactor, name));
+  std::shared_ptr<MivoBackend> backend(new MivoBackend(bundle, counters, random, name, productFamily));
   logInfo("MivoBackend(initWithName): Loading Mivo adaptor class for client type %d", clientType);
   if (!isClientTypeAllowed(clientType)) {
     logError("MivoBackend(initWithName): No matching bundle found for client type %d", clientType);
@@ -20,6 +21,10 @@ std::shared_ptr<MivoBackend> MivoBackend::initWithName(CodeBundle& bundle, platf
   backend->loadAdaptor();
   return backend;
 }
+
+MivoBackend::MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
+                         const std::string& name, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, random), _counters(counters), _clientBundle(bundle) {}
 
 void MivoBackend::loadAdaptor() {
   std::string failure;

@@ -19,8 +19,8 @@ class MivoBackend final : public VeltraBackend {
  public:
   // Null, after one error line, if the client type has no adaptor.
   static std::shared_ptr<MivoBackend> initWithName(CodeBundle& bundle, platform::Counters& counters,
-                                                   double samplingFactor, const std::string& name,
-                                                   std::int32_t clientType);
+                                                   platform::Random& random, const std::string& name,
+                                                   const std::string& productFamily, std::int32_t clientType);
 
   static bool isClientTypeAllowed(std::int32_t clientType) { return isAdaptorClientType(clientType); }
 
@@ -28,9 +28,8 @@ class MivoBackend final : public VeltraBackend {
   Sent sendNumberedMessage(NumberedMessage&& message) override;
 
  private:
-  MivoBackend(CodeBundle& bundle, platform::Counters& counters, double samplingFactor,
-              const std::string& name)
-      : VeltraBackend(name, samplingFactor), _counters(counters), _clientBundle(bundle) {}
+  MivoBackend(CodeBundle& bundle, platform::Counters& counters, platform::Random& random,
+              const std::string& name, const std::string& productFamily);
   void loadAdaptor();
   Sent dropped(const NumberedMessage& message, wire::Reason why);
 

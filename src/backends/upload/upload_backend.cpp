@@ -51,20 +51,21 @@ void sayUnreadable(const std::string& path, int error) {
 
 std::shared_ptr<UploadBackend> UploadBackend::initWithName(const UploadMaking& making,
                                                            const std::string& name,
-                                                           const config::UploadProfile* profile) {
+                                                           const config::UploadProfile* profile,
+                                                           const std::string& productFamily) {
   if (!profile || !profile->postURL) {
     logError("UploadBackend(initWithName): can't resolve upload post URL.");
     making.counters.count(wire::Reason::no_post_url);
     return nullptr;
   }
-  std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile->postURL));
+  std::shared_ptr<UploadBackend> backend(new UploadBackend(making, name, *profile->postURL, productFamily));
   backend->setDisplayURL(profile->displayURL);
   return backend;
 }
 
 UploadBackend::UploadBackend(const UploadMaking& making, const std::string& name,
-                             const std::string& uploadURL)
-    : VeltraBackend(name, making.samplingFactor),
+                             const std::string& uploadURL, const std::string& productFamily)
+    : VeltraBackend(name, productFamily, making.random),
       _uploads(making.uploads),
       _http(making.http),
       _lentFiles(making.lentFiles),

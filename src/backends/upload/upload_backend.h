@@ -20,7 +20,7 @@ class FileUploads;
 
 // What an upload back end uses. The references outlive it.
 struct UploadMaking {
-  double samplingFactor = 0;
+  platform::Random& random;
   FileUploads& uploads;
   http::HTTPClient& http;
   platform::LentFiles& lentFiles;
@@ -35,7 +35,8 @@ class UploadBackend final : public VeltraBackend {
   // From a storebag's section: "post_url" (without a query) and optionally "display_url". Null, after one
   // error line, without "post_url".
   static std::shared_ptr<UploadBackend> initWithName(const UploadMaking& making, const std::string& name,
-                                                     const config::UploadProfile* profile);
+                                                     const config::UploadProfile* profile,
+                                                     const std::string& productFamily);
 
   // True if the request was made, whatever the result: only the answer decides whether the client is asked to
   // remove its file. Otherwise an error line says why not.
@@ -44,7 +45,8 @@ class UploadBackend final : public VeltraBackend {
   std::vector<std::string> hosts() const override { return {http::hostName(_uploadURL)}; }
 
  private:
-  UploadBackend(const UploadMaking& making, const std::string& name, const std::string& uploadURL);
+  UploadBackend(const UploadMaking& making, const std::string& name, const std::string& uploadURL,
+                const std::string& productFamily);
 
   std::optional<FileSnapshot> fileToUpload(const platform::LentFile* lent, const std::string& path) const;
   bool comesFromOthers(const platform::LentFile* lent, const std::string& path) const;
