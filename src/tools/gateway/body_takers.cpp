@@ -8,6 +8,7 @@
 #include "base/text.h"
 #include "formats/json.h"
 #include "formats/property_list.h"
+#include "gateway/attempt.h"
 #include "gateway/digest.h"
 #include "gateway/envelope.h"
 #include "gateway/piece_writer.h"
@@ -24,8 +25,6 @@ constexpr std::size_t kLocationDigits = 32;
 // a short list can hold the same long text many times.
 constexpr std::size_t kLongTurnBytes = 64u << 10;
 
-using Answering = std::function<void(Answer)>;
-
 // The message's ID and, where the device has sent one, the post's.
 void identify(Message& message, const Wanted& wanted, const std::string& digest) {
   message.id = wanted.postID.empty() ? digest : wanted.postID;
@@ -41,167 +40,210 @@ std::string headerText(const Dictionary& fields) {
   return text;
 }
 
-const char* reasonOf(Outcome outcome) {
-  return outcome == Outcome::late ? "held_too_long" : "no_room";
-}
-
-// What becomes of the request: `answer` if the stream has taken the message.
-Publisher::Completion answeringWith(const DoorServices& services, Answer answer,
-                                    std::atomic<std::uint64_t>& counter, std::uint64_t events,
-                                    Answering answering) {
-  return [&services, answer = std::move(answer), &counter, events,
-          answering = std::move(answering)](Outcome outcome) {
-    if (outcome != Outcome::taken) return answering(services.refusals.busy(reasonOf(outcome)));
-    counter.fetch_add(1, std::memory_order_relaxed);
-    services.metrics.events.fetch_add(events, std::memory_order_relaxed);
-    answering(answer);
-  };
-}
-
-class EventsTaker final : public BodyTaker {
+// Has the stream take what the body holds. The request is answered when it has.
+class StreamingTaker : public BodyTaker {
  public:
-  EventsTaker(const DoorServices& services, Wanted wanted, Charge charge)
-      : _services(services),
-        _wanted(std::move(wanted)),
-        _body(services, std::move(charge), _wanted.packed, services.bounds.events) {}
-
-  std::optional<Answer> take(std::string_view& bytes) override { return _body.add(bytes); }
-  bool hasRoom(std::function<void()>) override { return true; }
-
-  void finish(Answering answering) override {
-    if (auto refusal = _body.end()) return answering(std::move(*refusal));
-    if (_body.text().size() <= kLongTurnBytes) return check(std::move(answering));
-    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  Answer answer() final {
+    if (_refusal) return std::move(*_refusal);
+    return _outcome == Outcome::taken ? takenAnswer() : services.refusals.busy(reasonOf(_outcome));
   }
+
+ protected:
+  StreamingTaker(const DoorServices& used, Wanted decided) : services(used), wanted(std::move(decided)) {}
+
+  // Also counts it.
+  virtual Answer takenAnswer() = 0;
+  void refuse(Answer refusal) { _refusal = std::move(refusal); }
+  void end(Outcome outcome) { _outcome = outcome; }
+  Publisher::Completion ending(const std::function<void()>& done) {
+    return [this, done](Outcome outcome) {
+      end(outcome);
+      done();
+    };
+  }
+
+  const DoorServices& services;
+  const Wanted wanted;
 
  private:
-  void check(Answering answering) {
-    const auto envelope = parseEnvelope(_body.text());
-    if (!envelope) return answering(_services.refusals.malformed("events", envelope.error(), _body.text()));
-    const std::uint64_t count = envelope.value().events.size();
-    Message message{subject::kEvents, "", {}, {}};
-    identify(message, _wanted, digestOf(_wanted.path, _body.text()));
-    if (!_wanted.via.empty()) message.headers.emplace_back(header::kVia, _wanted.via);
-    message.body = _body.take();
-    if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
-    publishWhole(_services.publisher, std::move(message),
-                 answeringWith(_services, Answer{}, _services.metrics.posts, count, std::move(answering)));
-  }
-
-  const DoorServices& _services;
-  const Wanted _wanted;
-  ReceivedBody _body;
+  std::optional<Answer> _refusal;
+  Outcome _outcome = Outcome::taken;
 };
 
-class LogDataTaker final : public BodyTaker {
+// A body that is checked when all of it has come.
+class CheckedTaker : public StreamingTaker {
  public:
-  LogDataTaker(const DoorServices& services, Wanted wanted, Charge charge)
-      : _services(services),
-        _wanted(std::move(wanted)),
-        _body(services, std::move(charge), _wanted.packed, services.bounds.logData) {}
+  std::optional<Answer> take(std::string_view& bytes) final { return body.add(bytes); }
+  bool hasRoom(std::function<void()>) final { return true; }
 
-  std::optional<Answer> take(std::string_view& bytes) override { return _body.add(bytes); }
-  bool hasRoom(std::function<void()>) override { return true; }
-
-  void finish(Answering answering) override {
-    if (auto refusal = _body.end()) return answering(std::move(*refusal));
-    _services.aside([this, answering = std::move(answering)]() mutable { check(std::move(answering)); });
+  void finish(std::function<void()> done) final {
+    if (auto refusal = body.end()) {
+      refuse(std::move(*refusal));
+      done();
+    } else if (isShort()) {
+      publish(done);
+    } else {
+      services.aside([this, done = std::move(done)] { publish(done); });
+    }
   }
 
+ protected:
+  CheckedTaker(const DoorServices& used, Wanted decided, Charge charge, std::uint64_t most)
+      : StreamingTaker(used, std::move(decided)), body(used, std::move(charge), wanted.packed, most) {}
+
+  // Whether a check takes so little time that others may wait for it.
+  virtual bool isShort() const = 0;
+  // What the body becomes, or why it is refused.
+  virtual Result<Message, Answer> check() = 0;
+
+  ReceivedBody body;
+
  private:
-  void check(Answering answering) {
+  void publish(const std::function<void()>& done) {
+    const bool found = attempt([&] {
+      auto message = check();
+      if (message && body.becomes(message.value()))
+        return publishWhole(services.publisher, std::move(message).value(), ending(done));
+      refuse(message ? services.refusals.busy("no_room") : std::move(message.error()));
+      done();
+    });
+    if (found) return;
+    end(Outcome::shortage);
+    done();
+  }
+};
+
+class EventsTaker final : public CheckedTaker {
+ public:
+  EventsTaker(const DoorServices& used, Wanted decided, Charge charge)
+      : CheckedTaker(used, std::move(decided), std::move(charge), used.bounds.events) {}
+
+ private:
+  bool isShort() const override { return body.text().size() <= kLongTurnBytes; }
+
+  Result<Message, Answer> check() override {
+    const auto envelope = parseEnvelope(body.text());
+    if (!envelope) return Failure{services.refusals.malformed("events", envelope.error(), body.text())};
+    _count = envelope.value().events.size();
+    if (_count > services.bounds.eventsInOne)
+      return Failure{services.refusals.malformed(
+          "events", fmt::format("{} events, at most {} are taken", _count, services.bounds.eventsInOne),
+          body.text())};
+    Message message{subject::kEvents, "", {}, {}};
+    identify(message, wanted, digestOf(wanted.path, body.text()));
+    if (!wanted.via.empty()) message.headers.emplace_back(header::kVia, wanted.via);
+    message.body = body.take();
+    return message;
+  }
+
+  Answer takenAnswer() override {
+    ++services.metrics.posts;
+    services.metrics.events += _count;
+    return {};
+  }
+
+  std::uint64_t _count = 0;
+};
+
+class LogDataTaker final : public CheckedTaker {
+ public:
+  LogDataTaker(const DoorServices& used, Wanted decided, Charge charge)
+      : CheckedTaker(used, std::move(decided), std::move(charge), used.bounds.logData) {}
+
+ private:
+  bool isShort() const override { return false; }
+
+  Result<Message, Answer> check() override {
     auto text = json();
-    if (!text) return answering(std::move(text.error()));
-    const std::string digest = digestOf(_wanted.path, _body.text());
-    const std::string location = "/logdata/" + digest.substr(0, kLocationDigits);
-    Message message{subject::kLogData, "", {{header::kLocation, location}}, std::move(text).value()};
-    identify(message, _wanted, digest);
-    if (!_body.becomes(message)) return answering(_services.refusals.busy("no_room"));
-    publishWhole(_services.publisher, std::move(message),
-                 answeringWith(_services, Answer{200, location, "text/plain", {}}, _services.metrics.logData,
-                               0, std::move(answering)));
+    if (!text) return Failure{std::move(text.error())};
+    const std::string digest = digestOf(wanted.path, body.text());
+    _location = "/logdata/" + digest.substr(0, kLocationDigits);
+    Message message{subject::kLogData, "", {{header::kLocation, _location}}, std::move(text).value()};
+    identify(message, wanted, digest);
+    return message;
   }
 
   // As JSON a list can be many times as long, so more than the bound is never written.
   Result<std::string, Answer> json() {
-    const auto list = formats::parsePropertyList(_body.text(), kLogDataLimits);
+    const auto list = formats::parsePropertyList(body.text(), kLogDataLimits);
     if (!list)
-      return Failure{_services.refusals.malformed("log_data", list.error().description(), _body.text())};
+      return Failure{services.refusals.malformed("log_data", list.error().description(), body.text())};
     if (!list.value().asArray())
-      return Failure{_services.refusals.malformed("log_data", "it is no array", _body.text())};
-    auto text = formats::excerptOfJSON(list.value(), _services.bounds.logData);
+      return Failure{services.refusals.malformed("log_data", "it is no array", body.text())};
+    auto text = formats::excerptOfJSON(list.value(), services.bounds.logData);
     if (text.leftOut > 0)
-      return Failure{_services.refusals.answer(
-          {413, "too_large", fmt::format("as JSON it has more than {} bytes", _services.bounds.logData)})};
+      return Failure{services.refusals.answer(
+          {413, "too_large", fmt::format("as JSON it has more than {} bytes", services.bounds.logData)})};
     text.text.shrink_to_fit();
     return std::move(text.text);
   }
 
-  const DoorServices& _services;
-  const Wanted _wanted;
-  ReceivedBody _body;
+  Answer takenAnswer() override {
+    Answer answer{200, _location, "text/plain", {}};
+    ++services.metrics.logData;
+    return answer;
+  }
+
+  std::string _location;
 };
 
 // The stream has most of a large file before its end is known to be good; without the last piece nothing of
 // it comes into the tables.
-class FileTaker final : public BodyTaker {
+class FileTaker final : public StreamingTaker {
  public:
-  FileTaker(const DoorServices& services, Wanted wanted, Charge charge)
-      : _services(services),
-        _wanted(std::move(wanted)),
+  FileTaker(const DoorServices& used, Wanted decided, Charge charge)
+      : StreamingTaker(used, std::move(decided)),
         _charge(std::move(charge)),
-        _gunzip(services.bounds.unpackedFile),
-        _pieces(services.publisher) {
-    _message.add(_wanted.path);
+        _gunzip(used.bounds.unpackedFile),
+        _pieces(used.publisher) {
+    _message.add(wanted.path);
     // A content that begins like the end of another path is another file.
     _message.add(std::string_view("\0", 1));
   }
 
   std::optional<Answer> take(std::string_view& bytes) override {
     if (const Outcome pieces = _pieces.outcome(); pieces != Outcome::taken)
-      return _services.refusals.busy(reasonOf(pieces));
+      return services.refusals.busy(reasonOf(pieces));
     std::string_view unpacked = bytes;
     const auto state = _gunzip.add(bytes, [this](std::string_view content) {
       _content.add(content);
-      if (_wanted.postID.empty()) _message.add(content);
+      if (wanted.postID.empty()) _message.add(content);
     });
     unpacked.remove_suffix(bytes.size());
     _received += unpacked.size();
-    if (_received > _services.bounds.packedFile)
-      return _services.refusals.answer({413, "too_large", "the file is too large"});
+    if (_received > services.bounds.packedFile)
+      return services.refusals.answer({413, "too_large", "the file is too large"});
     if (state != support::Gunzip::State::open && state != support::Gunzip::State::ended)
-      return refused(state, unpacked);
+      return services.refusals.gzip(state, services.bounds.unpackedFile, unpacked);
     _pieces.add(unpacked);
     return std::nullopt;
   }
   bool hasRoom(std::function<void()> resume) override { return _pieces.hasRoom(std::move(resume)); }
 
-  void finish(Answering answering) override {
-    if (_gunzip.state() != support::Gunzip::State::ended) return answering(refused(_gunzip.state(), ""));
+  void finish(std::function<void()> done) override {
+    if (_gunzip.state() != support::Gunzip::State::ended) {
+      refuse(services.refusals.gzip(_gunzip.state(), services.bounds.unpackedFile, ""));
+      return done();
+    }
     const Dictionary file{{"uuid", parameter("uuid")},         {"sequence", parameter("sequence")},
                           {"filename", parameter("filename")}, {"description", parameter("description")},
                           {"sha256", _content.hexDigits()},    {"bytes", _gunzip.unpackedBytes()}};
     Message message{subject::kFiles, "", {{header::kFile, headerText(file)}}, {}};
-    identify(message, _wanted, _message.hexDigits());
-    _pieces.commit(std::move(message),
-                   answeringWith(_services, Answer{200, "{\"success\":true}", "application/json", {}},
-                                 _services.metrics.files, 0, std::move(answering)));
+    identify(message, wanted, _message.hexDigits());
+    _pieces.commit(std::move(message), ending(done));
   }
 
  private:
-  Answer refused(support::Gunzip::State state, std::string_view bytes) {
-    const Refusal refusal = refusalOf(state, _services.bounds.unpackedFile);
-    if (state == support::Gunzip::State::shortage) return _services.refusals.busy("no_memory");
-    return refusal.status == 400 ? _services.refusals.malformed(refusal.reason, refusal.detail, bytes)
-                                 : _services.refusals.answer(refusal);
+  Answer takenAnswer() override {
+    Answer answer{200, "{\"success\":true}", "application/json", {}};
+    ++services.metrics.files;
+    return answer;
   }
   std::string parameter(const char* name) const {
-    const auto found = _wanted.query.find(name);
-    return found == _wanted.query.end() ? "" : found->second;
+    const auto found = wanted.query.find(name);
+    return found == wanted.query.end() ? "" : found->second;
   }
 
-  const DoorServices& _services;
-  const Wanted _wanted;
   const Charge _charge;
   support::Gunzip _gunzip;
   Digest _content;

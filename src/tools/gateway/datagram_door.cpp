@@ -14,6 +14,7 @@
 
 #include "config/client_types.h"
 #include "formats/json.h"
+#include "gateway/attempt.h"
 #include "gateway/digest.h"
 #include "platform/log.h"
 #include "tools/dashboard_packet.h"
@@ -124,7 +125,11 @@ void DatagramDoor::run() {
   for (;;) {
     ::poll(watched, 2, -1);
     if (watched[1].revents != 0) return;
-    for (int i = 0; i < kDatagramsAtOnce && receive(room, sizeof room); ++i) continue;
+    bool more = true;
+    for (int i = 0; i < kDatagramsAtOnce && more; ++i) {
+      // What there is no memory for is not acknowledged, so it comes again.
+      if (!attempt([&] { more = receive(room, sizeof room); })) _metrics.datagrams.add("no_memory");
+    }
   }
 }
 
@@ -158,24 +163,23 @@ bool DatagramDoor::receive(char* room, std::size_t size) {
 
 void DatagramDoor::handle(const Sender& sender, std::string_view datagram) {
   if (const char* fault = faultName(datagram)) return _metrics.datagrams.add(fault);
-  if (_socket->underWay.fetch_add(1) >= _most) {
-    _socket->underWay.fetch_sub(1);
-    return _metrics.datagrams.add("no_room");
-  }
+  if (_socket->underWay >= _most) return _metrics.datagrams.add("no_room");
   std::string answer = tools::asksForAcknowledgement(datagram) ? tools::acknowledgementOf(datagram) : "";
-  _publisher.publish(messageOfDatagram(datagram), [socket = _socket, sender, answer = std::move(answer),
-                                                   &metrics = _metrics](Outcome outcome) {
-    socket->underWay.fetch_sub(1);
-    if (outcome != Outcome::taken)
-      return metrics.datagrams.add(outcome == Outcome::late ? "held_too_long" : "no_room");
-    metrics.datagrams.add(answer.empty() ? "taken" : "acknowledged");
+  Message message = messageOfDatagram(datagram);
+  Publisher::Completion completion = [socket = _socket, sender, answer = std::move(answer),
+                                      &metrics = _metrics](Outcome outcome) {
+    --socket->underWay;
+    if (outcome != Outcome::taken) return metrics.datagrams.add(reasonOf(outcome));
     if (!answer.empty()) acknowledge(*socket, sender, answer);
-  });
+    metrics.datagrams.add(answer.empty() ? "taken" : "acknowledged");
+  };
+  ++_socket->underWay;
+  _publisher.publish(std::move(message), std::move(completion));
 }
 
-void DatagramDoor::acknowledge(const Socket& socket, const Sender& sender, std::string header) {
+void DatagramDoor::acknowledge(const Socket& socket, const Sender& sender, const std::string& header) {
   Control control{};
-  iovec part{header.data(), header.size()};
+  iovec part{const_cast<char*>(header.data()), header.size()};
   msghdr message{};
   message.msg_name = const_cast<sockaddr_in*>(&sender.from);
   message.msg_namelen = sizeof sender.from;

@@ -49,7 +49,7 @@ class DatagramDoor {
   void run();
   bool receive(char* room, std::size_t size);
   void handle(const Sender& sender, std::string_view datagram);
-  static void acknowledge(const Socket& socket, const Sender& sender, std::string header);
+  static void acknowledge(const Socket& socket, const Sender& sender, const std::string& header);
 
   Publisher& _publisher;
   Metrics& _metrics;

@@ -17,11 +17,14 @@
 
 namespace veltrad::gateway {
 
-// Of bodies, in bytes.
+// Of bodies, in bytes if nothing else is said.
 struct BodyBounds {
   // Events, packed and unpacked; log data.
   std::uint64_t events = 16u << 20;
   std::uint64_t logData = 32u << 20;
+  // In number: as many as a device posts at once, so that a small gzip stream does not become more rows than
+  // the largest post of a device.
+  std::uint64_t eventsInOne = 4'096;
   std::uint64_t packedFile = std::uint64_t{2} << 30;
   std::uint64_t unpackedFile = std::uint64_t{4} << 30;
   // What is kept of all until they are answered: of events, and of files and log data, which leaves half of

@@ -11,20 +11,6 @@ namespace veltrad::gateway {
 
 using support::Gunzip;
 
-Refusal refusalOf(Gunzip::State state, std::uint64_t most) {
-  switch (state) {
-    case Gunzip::State::tail:
-      return {400, "gzip", "bytes follow the gzip stream"};
-    case Gunzip::State::tooLarge:
-      return {413, "too_large",
-              fmt::format("the body unpacks to more than {} bytes, or to far more than what came", most)};
-    case Gunzip::State::open:
-      return {400, "gzip", "the gzip stream is cut short"};
-    default:
-      return {400, "gzip", "it is no gzip stream"};
-  }
-}
-
 ReceivedBody::ReceivedBody(const DoorServices& services, Charge charge, bool packed, std::uint64_t most)
     : _services(services), _most(most), _charge(std::move(charge)), _chargedWithoutText(_charge.bytes()) {
   if (packed) _gunzip.emplace(most);
@@ -44,13 +30,6 @@ bool ReceivedBody::keep(std::string_view bytes) {
   return true;
 }
 
-Answer ReceivedBody::refusedGzip(Gunzip::State state) {
-  if (state == Gunzip::State::shortage) return _services.refusals.busy("no_memory");
-  const Refusal refusal = refusalOf(state, _most);
-  return refusal.status == 400 ? _services.refusals.malformed(refusal.reason, refusal.detail, _text)
-                               : _services.refusals.answer(refusal);
-}
-
 std::optional<Answer> ReceivedBody::add(std::string_view& bytes) {
   const std::string_view given = bytes;
   bool room = true;
@@ -68,12 +47,12 @@ std::optional<Answer> ReceivedBody::add(std::string_view& bytes) {
   if (!room) return _services.refusals.busy("no_room");
   if (state == Gunzip::State::open || state == Gunzip::State::ended) return std::nullopt;
   if (_text.empty()) _text = given.substr(0, Refusals::kMostKeptBytes);
-  return refusedGzip(state);
+  return _services.refusals.gzip(state, _most, _text);
 }
 
 std::optional<Answer> ReceivedBody::end() {
   if (!_gunzip || _gunzip->state() == Gunzip::State::ended) return std::nullopt;
-  return refusedGzip(_gunzip->state());
+  return _services.refusals.gzip(_gunzip->state(), _most, _text);
 }
 
 std::string ReceivedBody::take() {

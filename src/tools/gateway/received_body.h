@@ -28,7 +28,6 @@ class ReceivedBody {
   bool becomes(const Message& message);
 
  private:
-  Answer refusedGzip(support::Gunzip::State state);
   bool keep(std::string_view bytes);
 
   const DoorServices& _services;
@@ -39,8 +38,5 @@ class ReceivedBody {
   std::string _text;
   std::uint64_t _received = 0;
 };
-
-// The status and reason of a gzip stream that is not as it should be.
-Refusal refusalOf(support::Gunzip::State state, std::uint64_t most);
 
 }  // namespace veltrad::gateway

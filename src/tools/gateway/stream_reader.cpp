@@ -38,6 +38,11 @@ struct FreeMetaData {
   void operator()(jsMsgMetaData* data) const { jsMsgMetaData_Destroy(data); }
 };
 
+struct MessageList : natsMsgList {
+  MessageList() : natsMsgList{} {}
+  ~MessageList() { natsMsgList_Destroy(this); }
+};
+
 }  // namespace
 
 Result<std::unique_ptr<StreamReader>, std::string> StreamReader::open(StreamOptions options) {
@@ -94,7 +99,7 @@ Result<Done, std::string> StreamReader::startBehind(std::uint64_t seq) {
 }
 
 Result<std::vector<Taken>, std::string> StreamReader::read(int most) {
-  natsMsgList list{};
+  MessageList list;
   jsFetchRequest wanted;
   jsFetchRequest_Init(&wanted);
   wanted.Batch = most;
@@ -106,10 +111,9 @@ Result<std::vector<Taken>, std::string> StreamReader::read(int most) {
     return Failure{failureOf("the stream cannot be read", status, static_cast<jsErrCode>(0))};
   std::vector<Taken> taken;
   taken.reserve(static_cast<std::size_t>(list.Count));
-  std::optional<std::string> fault;
-  for (int at = 0; at < list.Count && !fault; ++at) fault = add(list.Msgs[at], taken);
-  natsMsgList_Destroy(&list);
-  if (fault) return Failure{std::move(*fault)};
+  for (int at = 0; at < list.Count; ++at) {
+    if (auto fault = add(list.Msgs[at], taken)) return Failure{std::move(*fault)};
+  }
   return taken;
 }
 

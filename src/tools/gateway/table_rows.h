@@ -14,11 +14,12 @@
 
 namespace veltrad::gateway {
 
-// Writes one row, column by column.
+// Writes one row behind those that are there, column by column.
 class CopyRow {
  public:
-  explicit CopyRow(std::string& out) : _out(out) {}
-  ~CopyRow() { _out += '\n'; }
+  explicit CopyRow(std::string& out) : _out(out) {
+    if (!_out.empty()) _out += '\n';
+  }
   CopyRow(const CopyRow&) = delete;
 
   CopyRow& text(std::string_view text);

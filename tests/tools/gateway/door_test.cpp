@@ -1,8 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 // What a request's head decides, and what a datagram becomes.
+#include <fmt/format.h>
 #include <gmock/gmock.h>
 
+#include <atomic>
+
 #include "base/property_list.h"
+#include "fakes/scarce_memory.h"
 #include "formats/json.h"
 #include "gateway/datagram_door.h"
 #include "gateway/door.h"
@@ -108,47 +112,51 @@ class Room : public testing::Test {
     return options;
   }
   // The taker, or nothing: refused with 429.
-  std::unique_ptr<BodyTaker> open(const FakeHead& head) {
+  BodyTaker* open(const FakeHead& head) {
     auto handled = door.request(head);
-    if (auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled)) return std::move(*taker);
-    EXPECT_EQ(std::get<Answer>(handled).status, 429);
-    return nullptr;
+    if (auto* refusal = std::get_if<Answer>(&handled)) {
+      EXPECT_EQ(refusal->status, 429);
+      return nullptr;
+    }
+    takers.push_back(std::move(std::get<std::unique_ptr<BodyTaker>>(handled)));
+    return takers.back().get();
   }
   // The status of the refusal; 0: the whole is held.
   static int post(BodyTaker& taker, std::string_view body) {
     while (!body.empty()) {
       if (const auto refusal = taker.take(body)) return refusal->status;
     }
-    const auto status = std::make_shared<int>(0);
-    taker.finish([status](const Answer& answer) { *status = answer.status; });
-    return *status;
+    const auto isDone = std::make_shared<bool>(false);
+    taker.finish([isDone] { *isDone = true; });
+    return *isDone ? taker.answer().status : 0;
   }
 
   Metrics metrics;
   std::unique_ptr<Publisher> publisher;
   Door door;
+  // Those of messages that are held must stay.
+  std::vector<std::unique_ptr<BodyTaker>> takers;
   const FakeHead upload = head("/upload?sequence=1", {{"Content-Encoding", "gzip"}});
 };
 
 TEST_F(Room, OfEventsIsNotTakenByFiles) {
-  auto large = open(upload);
-  ASSERT_TRUE(large);
+  ASSERT_TRUE(open(upload));
   EXPECT_FALSE(open(upload));
   FakeHead small = upload;
   small.bytes = 1'000;
   EXPECT_TRUE(open(small)) << "what it can keep at most is known";
   EXPECT_TRUE(open(head("/events")));
-  large.reset();
+  takers.clear();
   EXPECT_TRUE(open(upload));
 }
 
 TEST_F(Room, IsTakenByWhatABodyKeeps) {
   const std::string start = R"({"clientId":"c","events":[]})";
-  const auto first = open(head("/events")), second = open(head("/events"));
+  BodyTaker *const first = open(head("/events")), *const second = open(head("/events"));
   EXPECT_EQ(post(*first, start + std::string(40'000, ' ')), 0);
   EXPECT_EQ(post(*second, start + std::string(40'000, ' ') + "\n"), 429);
-  const auto packed = open(head("/events", {{"Content-Encoding", "gzip"}}));
-  EXPECT_FALSE(packed) << "the first is held still, and zlib needs more than is left";
+  EXPECT_FALSE(open(head("/events", {{"Content-Encoding", "gzip"}})))
+      << "the first is held still, and zlib needs more than is left";
   EXPECT_EQ(publisher->held(), 1u);
 }
 
@@ -174,13 +182,60 @@ TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
   }
 }
 
+TEST_F(Room, IsNotLeftToASmallBodyOfManyEvents) {
+  std::string events = "{}";
+  for (int i = 1; i < 4'096; ++i) events += ",{}";
+  const std::string start = R"({"clientId":"c","events":[)";
+  EXPECT_EQ(post(*open(head("/events")), start + events + "]}"), 0);
+  EXPECT_EQ(post(*open(head("/events")), start + events + ",{}]}"), 400);
+}
+
+// Whatever finds no memory: a request is held, or ended once, or was not taken.
+TEST_F(Room, OfMemoryIsFoundForAWholeRequest) {
+  Door roomy(*publisher, metrics, {}, 429, [](const std::function<void()>& work) { work(); });
+  const std::pair<const char*, std::string> rows[] = {
+      {"/events", R"({"clientId":"c","events":[{"a":1}]})"},
+      {"/logdata", writeBinaryPropertyList(Array{"a"})},
+      {"/upload?sequence=1&uuid=u", *support::GzipCompressor().gzipDeflate({"content"}, 1)},
+  };
+  const auto ends = std::make_shared<std::atomic<int>>(0);
+  int number = 0;
+  for (const auto& [path, body] : rows) {
+    forEachShortage([&, &path = path, &body = body](const auto& whenShort) {
+      FakeHead request = head(path, {{"X-VLT-Post-ID", fmt::format("{:032x}", ++number)}});
+      if (body.starts_with('\x1f')) request.fields["Content-Encoding"] = "gzip";
+      takers.emplace_back();
+      const int before = *ends;
+      const std::size_t held = publisher->held();
+      bool isWhole = false;
+      std::optional<Answer> refusal;
+      whenShort([&] {
+        auto handled = roomy.request(request);
+        if (auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled))
+          takers.back() = std::move(*taker);
+        std::string_view bytes = body;
+        if (takers.back()) refusal = takers.back()->take(bytes);
+        if (!takers.back() || refusal) return;
+        takers.back()->finish([ends] { ++*ends; });
+        isWhole = true;
+      });
+      EXPECT_EQ(publisher->held() - held + static_cast<std::size_t>(*ends - before), isWhole ? 1u : 0u)
+          << path;
+      if (*ends > before) EXPECT_EQ(takers.back()->answer().status, 429);
+    });
+  }
+  publisher.reset();
+  EXPECT_GT(*ends, number / 6) << "each that was held ended with the publisher";
+  takers.clear();  // before the door
+}
+
 TEST_F(Room, EndsAFileOfWhichAPieceWasNotTaken) {
   std::string content;
   for (std::uint32_t number = 1; content.size() < 3 * kHeldBytes; number = number * 1'664'525 + 1'013'904'223)
     content += static_cast<char>(number >> 24);
   const std::string packed = *support::GzipCompressor().gzipDeflate({content}, 1);
   std::string_view rest = packed;
-  const auto taker = open(upload);
+  BodyTaker* const taker = open(upload);
   std::optional<Answer> refusal;
   while (!refusal && !rest.empty()) {
     std::string_view piece = rest.substr(0, 10'000);
