@@ -172,9 +172,10 @@ def lint_units(bodies):
     the flags they are compiled with. A unit becomes one file, because most of clang-tidy's time goes into the headers."""
     folders = collections.defaultdict(list)
     for entry in json.loads((ROOT / "build/lint/compile_commands.json").read_text()):
-        if Path(entry["file"]) in bodies:
-            command, _, target = entry["command"].partition(" -o ")
-            folders[target.split("/CMakeFiles/")[0]].append((entry["file"], command.split(" ", 1)[1]))
+        command, _, target = entry["command"].partition(" -o ")
+        folder = target.split("/CMakeFiles/")[0]
+        if Path(entry["file"]) in bodies and Path(entry["file"]).is_relative_to(ROOT / folder):  # others borrow it
+            folders[folder].append((entry["file"], command.split(" ", 1)[1]))
     units = []
     for commands in folders.values():
         commands.sort()

@@ -1,16 +1,17 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Builds the given presets (default: dev; all: every one), runs every test program in each and prints the totals."""
+"""Builds the given presets (default: plain; all: and both sanitizers; gateway: plain, with tests/fleet), runs every test program
+in each and prints the totals."""
+import concurrent.futures
 import os
 import re
-import shutil
 import subprocess
 import sys
 import time
 from pathlib import Path
 
 ROOT = Path(__file__).resolve().parent.parent
-ALL = ["dev", "asan", "tsan"]
-PRESETS = [*ALL, "plain"]
+PRESETS = {"plain": ["plain"], "dev": ["dev"], "asan": ["asan"], "tsan": ["tsan"], "all": ["plain", "asan", "tsan"],
+           "gateway": ["plain"]}
 TIMEOUT_SECONDS = 900
 SANITIZER_OPTIONS = {
     "ASAN_OPTIONS": "detect_leaks=1:detect_stack_use_after_return=1:abort_on_error=0",
@@ -56,45 +57,48 @@ def run(command, environment):
     return passed, failed, output
 
 
-def programs(preset):
+def programs(preset, with_fleet):
+    """What runs two at a time, and what runs alone after it."""
     binaries = ROOT / "build" / preset / "bin"
-    for program in sorted(binaries.glob("test_*")):
-        yield [str(program), "--gtest_brief=1"]
-    for program in sorted(binaries.glob("replay_*")):
-        yield [str(program), "tests/fuzz/corpus/" + program.name.removeprefix("replay_")]
+    together = [[str(program), "--gtest_brief=1"] for program in sorted(binaries.glob("test_*"))]
+    together += [[str(program), "tests/fuzz/corpus/" + program.name.removeprefix("replay_")]
+                 for program in sorted(binaries.glob("replay_*"))]
     if preset in ("dev", "plain"):
-        yield [sys.executable, "tests/must_not_compile/run.py"]
-    yield [sys.executable, "tests/e2e/run.py"]
-    # Without the gateway or its servers (scripts/setup gateway) there is nothing to run. It takes minutes, so CI leaves it out.
-    if preset == "dev" and (binaries / "veltra-gateway").exists() and shutil.which("nats-server"):
-        yield [sys.executable, "tests/fleet/run.py"]
+        together.append([sys.executable, "tests/must_not_compile/run.py"])
+    alone = [[sys.executable, "tests/e2e/run.py"]]
+    if with_fleet:
+        alone.append([sys.executable, "tests/fleet/run.py"])
+    return together, alone
 
 
-def test(preset):
+def test(preset, with_fleet):
     environment = dict(os.environ, VELTRA_BUILD=f"build/{preset}", **SANITIZER_OPTIONS)
-    total = [0, 0]
-    for command in programs(preset):
+
+    def run_and_say(command):
         started = time.monotonic()
         passed, failed, output = run(command, environment)
-        total[0] += passed
-        total[1] += failed
         last = Path(command[-1]) if command[0] == sys.executable else Path(command[0])
         name = last.parent.name if last.name == "run.py" else last.name
-        say(f"{preset}: {name}: {passed} passed, {failed} failed ({time.monotonic() - started:.1f} s)")
-        if failed:
-            print(output, flush=True)
-    return total
+        say(f"{preset}: {name}: {passed} passed, {failed} failed ({time.monotonic() - started:.1f} s)"
+            + ("\n" + output if failed else ""))
+        return passed, failed
+
+    together, alone = programs(preset, with_fleet)
+    with concurrent.futures.ThreadPoolExecutor(2) as pool:  # unit tests mostly wait
+        results = list(pool.map(run_and_say, together))
+    results += map(run_and_say, alone)
+    return [sum(column) for column in zip(*results)]
 
 
 def main():
-    presets = ALL if sys.argv[1:] == ["all"] else sys.argv[1:] or ["dev"]
-    unknown = [preset for preset in presets if preset not in PRESETS]
-    if unknown:
-        sys.exit(f"scripts/test: unknown preset {unknown[0]}; expected all, or some of: {' '.join(PRESETS)}")
+    arguments = sys.argv[1:] or ["plain"]
+    for argument in arguments:
+        if argument not in PRESETS:
+            sys.exit(f"scripts/test: unknown preset {argument}; expected some of: {' '.join(PRESETS)}")
     passed = failed = 0
-    for preset in presets:
+    for preset in dict.fromkeys(preset for argument in arguments for preset in PRESETS[argument]):
         if build(preset):
-            more_passed, more_failed = test(preset)
+            more_passed, more_failed = test(preset, "gateway" in arguments)
             passed, failed = passed + more_passed, failed + more_failed
         else:
             say(f"{preset}: does not build")

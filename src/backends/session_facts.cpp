@@ -3,8 +3,8 @@
 #include "backends/session_facts.h"
 
 #include <functional>
-#include <limits>
 
+#include "base/null_value.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
@@ -16,8 +16,7 @@ std::uint32_t connectionNumber(std::string_view sessionIDString) {
 SharedDictionary clientOf(const SessionFacts& facts) {
   const auto textOrNull = [&facts](const char* key) {
     const Dictionary* info = facts.sentUserInfo.get();
-    const std::string* text = info ? info->string(key) : nullptr;
-    return text ? Value(*text) : Value(std::numeric_limits<double>::quiet_NaN());
+    return orNull(info ? info->string(key) : nullptr);
   };
   return std::make_shared<const Dictionary>(
       Dictionary{{"clientType", facts.compType},
@@ -28,10 +27,9 @@ SharedDictionary clientOf(const SessionFacts& facts) {
 
 Dictionary aboutDeparture(const std::string& backend, const SessionFacts& facts,
                           std::optional<std::size_t> entry, const config::EditedFields& edits) {
-  const Value none = std::numeric_limits<double>::quiet_NaN();
   return {{"backend", backend},
-          {"storebag", facts.storebag ? Value(*facts.storebag) : none},
-          {"entry", entry ? Value(*entry) : none},
+          {"storebag", orNull(facts.storebag)},
+          {"entry", orNull(entry)},
           {"removed", Array(edits.removed.begin(), edits.removed.end())},
           {"hashed", Array(edits.hashed.begin(), edits.hashed.end())}};
 }

@@ -6,6 +6,7 @@
 
 #include <cstdlib>
 #include <memory>
+#include <new>
 #include <utility>
 
 namespace veltrad {
@@ -51,9 +52,9 @@ Thread& Thread::operator=(Thread&& other) noexcept {
 }
 
 bool Thread::start(const char* name, std::size_t stackBytes, std::function<void()> body) {
-  auto start = std::make_unique<Start>(Start{name, std::move(body)});
+  std::unique_ptr<Start> start(new (std::nothrow) Start{name, std::move(body)});
   pthread_attr_t attributes;
-  if (pthread_attr_init(&attributes) != 0) return false;
+  if (!start || pthread_attr_init(&attributes) != 0) return false;
   pthread_attr_setstacksize(&attributes, stackBytes);
   // The new thread inherits the mask: signals belong to the main thread.
   sigset_t all;

@@ -244,14 +244,6 @@ void Dictionary::merge(const Dictionary& other) {
   }
 }
 
-std::vector<Dictionary::Entry> Dictionary::takeEntries() && {
-  if (!_shared) return {};
-  std::vector<Entry> entries = std::move(own());
-  release();
-  _shared = nullptr;
-  return entries;
-}
-
 namespace {
 template <typename Result>
 Result readAs(const Dictionary& dictionary, std::string_view key, Result (Value::*as)() const) {

@@ -70,8 +70,6 @@ class Dictionary {
   std::optional<Array> takeArray(std::string_view key);
   // Adds or replaces every entry of `other`, in linear time.
   void merge(const Dictionary& other);
-  // All entries, in order; they are copied only if they are shared.
-  std::vector<Entry> takeEntries() &&;
 
   std::size_t size() const;
   std::size_t capacity() const;

@@ -68,27 +68,27 @@ CallFrame frameOfKind(wire::FrameKind kind, const char* operation, Entries argum
   body.emplace_back(key::kOperation, operation);
   Dictionary whole = Dictionary::fromEntries(std::move(body));
   std::string frame = wire::makeFrame(kind, 0, whole, descriptors);
-  if (!wire::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE, {}};
+  if (!wire::decodeFrameHeader(frame.data()).possible()) return {VELTRA_TOO_LARGE};
   // Every object takes at least one byte, so only a long frame needs to be counted.
   if (frame.size() > wire::kMostCallObjects && objectsIn(Value(std::move(whole))) > wire::kMostCallObjects) {
-    return {VELTRA_TOO_LARGE, {}};
+    return {VELTRA_TOO_LARGE};
   }
-  return {VELTRA_OK, std::move(frame)};
+  return {VELTRA_OK, {std::move(frame)}};
 }
 
-CallFrame counted(CallFrame call) {
-  call.counted = true;
-  return call;
+CallFrame counted(CallFrame made) {
+  made.call.counted = true;
+  return made;
 }
 
-CallFrame changing(CallFrame call, SessionChange change) {
-  if (call.status == VELTRA_OK) call.change = std::make_unique<SessionChange>(std::move(change));
-  return call;
+CallFrame changing(CallFrame made, SessionChange change) {
+  if (made.status == VELTRA_OK) made.call.change = std::make_unique<SessionChange>(std::move(change));
+  return made;
 }
 
 // A call whose only argument is a dictionary, which is left out if it is null.
 CallFrame dictionaryFrame(const char* operation, const char* argument, const veltra_value* dictionary) {
-  if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
+  if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status};
   Entries arguments;
   if (dictionary) arguments.emplace_back(argument, dictionaryOfNode(dictionary));
   return callFrame(operation, std::move(arguments));
@@ -110,8 +110,8 @@ CallFrame finishFrame() {
 
 CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_value* payload,
                        std::uint32_t flag) {
-  if (auto problem = problemOfFlag(flag)) return {VELTRA_INVALID, {}, nullptr, std::move(*problem)};
-  if (const auto status = verdictOn(payload); status != VELTRA_OK) return {status, {}};
+  if (auto problem = problemOfFlag(flag)) return {VELTRA_INVALID, {}, std::move(*problem)};
+  if (const auto status = verdictOn(payload); status != VELTRA_OK) return {status};
   Entries message;
   message.reserve(4);
   message.emplace_back(wire::kVeltraMessageParametersCategory, static_cast<unsigned>(category));
@@ -125,22 +125,22 @@ CallFrame messageFrame(std::uint16_t category, std::uint16_t type, const veltra_
 }
 
 CallFrame messageDictionaryFrame(const veltra_value* message) {
-  if (!message) return {VELTRA_INVALID, {}};
+  if (!message) return {VELTRA_INVALID};
   return counted(dictionaryFrame(operation::kSendDictionary, key::kMessage, message));
 }
 
 CallFrame statesFrame(const veltra_value* userInfo) {
   SessionChange change{SessionChange::Part::userInfo};
-  CallFrame call = dictionaryFrame(operation::kFetchStates, key::kUserInfo, userInfo);
-  if (call.status == VELTRA_OK && userInfo) change.described.set(key::kUserInfo, dictionaryOfNode(userInfo));
-  return changing(std::move(call), std::move(change));
+  CallFrame made = dictionaryFrame(operation::kFetchStates, key::kUserInfo, userInfo);
+  if (made.status == VELTRA_OK && userInfo) change.described.set(key::kUserInfo, dictionaryOfNode(userInfo));
+  return changing(std::move(made), std::move(change));
 }
 
 CallFrame sessionInfoFrame(const veltra_session_options& options) {
-  if (const auto status = verdictOn(options.user_info); status != VELTRA_OK) return {status, {}};
+  if (const auto status = verdictOn(options.user_info); status != VELTRA_OK) return {status};
   Entries arguments = identity(options);
   if (options.frameworks_to_check) {
-    if (!fits(*options.frameworks_to_check)) return {VELTRA_TOO_LARGE, {}};
+    if (!fits(*options.frameworks_to_check)) return {VELTRA_TOO_LARGE};
     arguments.emplace_back(key::kFrameworksToCheck, valueOfNode(*options.frameworks_to_check));
   }
   arguments.emplace_back(key::kHasAggregationBlock, options.aggregated != nullptr);
@@ -151,7 +151,7 @@ CallFrame sessionInfoFrame(const veltra_session_options& options) {
 CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category, std::uint16_t type,
                        const veltra_value* payload) {
   for (const veltra_value* dictionary : {who.user_info, payload}) {
-    if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status, {}};
+    if (const auto status = verdictOn(dictionary); status != VELTRA_OK) return {status};
   }
   Entries arguments = identity(who);
   SessionChange change{SessionChange::Part::sender, Dictionary::fromEntries(arguments)};
@@ -162,12 +162,12 @@ CallFrame oneShotFrame(const veltra_session_options& who, std::uint16_t category
 }
 
 CallFrame uploadFileFrame(const char* path) {
-  if (!path) return {VELTRA_INVALID, {}};
+  if (!path) return {VELTRA_INVALID};
   auto file = std::make_shared<UploadedFile>(path);
-  CallFrame call = frameOfKind(wire::FrameKind::call, operation::kUploadFile,
+  CallFrame made = frameOfKind(wire::FrameKind::call, operation::kUploadFile,
                                {{key::kPath, toUTF8(file->absolutePath())}}, file->descriptor() >= 0 ? 1 : 0);
-  call.file = std::move(file);
-  return counted(std::move(call));
+  made.call.file = std::move(file);
+  return counted(std::move(made));
 }
 
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
@@ -178,8 +178,8 @@ std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event) {
 }
 
 CallFrame logDataFrame(const veltra_value* data) {
-  if (!data || !data->items()) return {VELTRA_INVALID, {}};
-  if (!fits(*data)) return {VELTRA_TOO_LARGE, {}};
+  if (!data || !data->items()) return {VELTRA_INVALID};
+  if (!fits(*data)) return {VELTRA_TOO_LARGE};
   return counted(
       frameOfKind(wire::FrameKind::largeCall, operation::kUploadLogData, {{key::kData, valueOfNode(*data)}}));
 }

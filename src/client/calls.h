@@ -3,14 +3,12 @@
 #pragma once
 
 #include <cstdint>
-#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
 
 #include "base/value.h"
-#include "client/session_standing.h"
-#include "client/uploaded_file.h"
+#include "client/sent_record.h"
 #include "client/value_node.h"
 #include "veltra/veltra.h"
 
@@ -20,17 +18,11 @@ namespace veltrad::client {
 std::optional<std::uint32_t> callToRemoveFileOf(const Dictionary& event);
 
 struct CallFrame {
-  // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE; the frame is empty unless it is VELTRA_OK.
+  // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE; there is no call unless it is VELTRA_OK.
   veltra_status status;
-  std::string frame;
-  // Of an upload.
-  std::shared_ptr<UploadedFile> file = nullptr;
+  OutCall call = {};
   // What is wrong with an argument, if the status does not say enough.
   std::string problem = {};
-  // Null if the call changes nothing.
-  std::unique_ptr<SessionChange> change = nullptr;
-  // A message, a file or log data, which is counted when it is lost.
-  bool counted = false;
 };
 
 CallFrame callFrame(const char* operation, std::vector<Dictionary::Entry> arguments = {});

@@ -69,7 +69,7 @@ bool DaemonConnection::startThread() {
 
 // ---- Calls ----
 
-veltra_status DaemonConnection::send(CallFrame call, veltra_callback callback, void* context) {
+veltra_status DaemonConnection::send(OutCall call, veltra_callback callback, void* context) {
   std::shared_ptr<UploadedFile> file = call.file;
   const bool needsThread = callback || file;
   Lock lock(_lock);
@@ -79,7 +79,7 @@ veltra_status DaemonConnection::send(CallFrame call, veltra_callback callback, v
   return status;
 }
 
-Answer DaemonConnection::sendAndWait(CallFrame call) {
+Answer DaemonConnection::sendAndWait(OutCall call) {
   if (onOwnThread()) return answerOfStatus(VELTRA_WOULD_DEADLOCK);
   const bool starts = call.change && call.change->starts;
   std::shared_ptr<UploadedFile> file = call.file;

@@ -43,9 +43,9 @@ class DaemonConnection {
   ~DaemonConnection();
 
   // In the call's frame, the call ID is 0. Without a callback and a file, the caller gets no answer.
-  veltra_status send(CallFrame call, veltra_callback callback, void* context);
+  veltra_status send(OutCall call, veltra_callback callback, void* context);
   // The caller must settle the answer (settleUpload).
-  Answer sendAndWait(CallFrame call);
+  Answer sendAndWait(OutCall call);
   bool onOwnThread() const {
     return _ownThread.load(std::memory_order_relaxed) == std::this_thread::get_id();
   }

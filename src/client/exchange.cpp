@@ -156,16 +156,15 @@ void Exchange::tell(veltra_connection_state state, const char* why, ValuePointer
 
 // ---- Calls ----
 
-veltra_status Exchange::add(CallFrame call, CallTable::Call to) {
+veltra_status Exchange::add(OutCall call, CallTable::Call to) {
   // The connection's thread writes what waits, but it may be inside a callback.
   if (++_added % kAddedWithoutTrying == 0) writeWaiting();
   const bool starts = call.change && call.change->starts;
   const bool awaited = to.awaitsAnswer();
   const std::uint32_t callID =
       awaited || starts || _record.calls().shouldAsk(coarseNow()) ? _calls.takeID() : 0;
-  if (callID != 0) setCallID(call.frame, callID);
-  const veltra_status status =
-      _out.write({std::move(call.frame), std::move(call.file), std::move(call.change), call.counted});
+  if (callID != 0) setCallID(call.bytes, callID);
+  const veltra_status status = _out.write(std::move(call));
   if (status != VELTRA_OK) return status;
   if (starts) _startID = callID;
   if (to.waiter) to.waiter->callID = callID;

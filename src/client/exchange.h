@@ -48,7 +48,7 @@ class Exchange {
   void greetingFailed();
 
   // Sends the call, or lets it wait. A waiter gets the call's ID.
-  veltra_status add(CallFrame call, CallTable::Call to);
+  veltra_status add(OutCall call, CallTable::Call to);
   // Counts a call that is not taken.
   veltra_status refuse(veltra_status why) { return _out.refuse(why); }
   // Ends a call that was not written, if there is still no connection.

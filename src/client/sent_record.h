@@ -17,7 +17,7 @@ struct OutCall {
   // A whole frame.
   std::string bytes;
   // Null if there is no descriptor to send, or it was sent.
-  std::shared_ptr<const UploadedFile> file = nullptr;
+  std::shared_ptr<UploadedFile> file = nullptr;
   // Null if the call changes nothing.
   std::unique_ptr<SessionChange> change = nullptr;
   // A message, a file or log data, which is counted when it is lost.

@@ -64,22 +64,22 @@ veltra_status verdictOn(const veltra_session* session) {
   return session->connection->forked() ? VELTRA_FORKED : VELTRA_OK;
 }
 
-veltra_status send(veltra_session* session, client::CallFrame call, veltra_callback callback, void* context) {
+veltra_status send(veltra_session* session, client::CallFrame made, veltra_callback callback, void* context) {
   if (const auto status = verdictOn(session); status != VELTRA_OK) return status;
-  if (call.status != VELTRA_OK) return call.status;
-  return session->connection->send(std::move(call), callback, context);
+  if (made.status != VELTRA_OK) return made.status;
+  return session->connection->send(std::move(made.call), callback, context);
 }
 
-veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltra_reply** reply) {
+veltra_status sendAndWait(veltra_session* session, client::CallFrame made, veltra_reply** reply) {
   veltra_status status = verdictOn(session);
-  if (status == VELTRA_OK) status = call.status;
+  if (status == VELTRA_OK) status = made.status;
   client::Answer answer;
   if (status == VELTRA_OK) {
     const auto connection = session->connection;  // keeps it alive during a close() that ends this call
-    answer = connection->sendAndWait(std::move(call));
+    answer = connection->sendAndWait(std::move(made.call));
     client::settleUpload(*answer);
   } else {
-    answer = client::answerOfStatus(status, call.problem.empty() ? nullptr : call.problem.c_str());
+    answer = client::answerOfStatus(status, made.problem.empty() ? nullptr : made.problem.c_str());
   }
   const veltra_status result = answer->status;
   if (reply) *reply = answer.release();
@@ -89,7 +89,7 @@ veltra_status sendAndWait(veltra_session* session, client::CallFrame call, veltr
 client::CallFrame oneShot(const veltra_session_options* who, std::uint16_t category, std::uint16_t type,
                           const veltra_value* payload) {
   const auto options = client::completeOptions(who);
-  if (!options) return {VELTRA_INVALID, {}};
+  if (!options) return {VELTRA_INVALID};
   return client::oneShotFrame(*options, category, type, payload);
 }
 
@@ -129,13 +129,13 @@ veltra_session* veltra_session_create(const veltra_session_options* given, veltr
       return failed(failure->status, failure->text, status, error);
   } else {
     auto reached =
-        client::reachDaemon(wanted.path, options->undescribed ? "" : description.frame, wanted.patience);
+        client::reachDaemon(wanted.path, options->undescribed ? "" : description.call.bytes, wanted.patience);
     if (!reached) return failed(reached.error().status, reached.error().text, status, error);
     connected = std::move(reached).value();
   }
   std::string text;
   auto connection = client::DaemonConnection::make(
-      std::move(wanted), options->undescribed ? std::nullopt : std::optional(*description.change),
+      std::move(wanted), options->undescribed ? std::nullopt : std::optional(*description.call.change),
       std::move(connected), text);
   if (!connection) return failed(VELTRA_NO_DAEMON, text, status, error);
   return new veltra_session{std::move(connection), options->aggregated != nullptr};

@@ -26,9 +26,10 @@ bool DailyAllowance::take(const PolicyRules& rules, std::uint64_t events, std::u
   const bool limited = rules.dailyEvents || rules.dailyBytes;
   if (!_loaded && limited) return false;
   beginDay();
-  if (!fits(_events, events, rules.dailyEvents) || !fits(_bytes, bytes, rules.dailyBytes)) return false;
-  _events += events;
-  _bytes += bytes;
+  if (!fits(_account->events, events, rules.dailyEvents) || !fits(_account->bytes, bytes, rules.dailyBytes))
+    return false;
+  _account->events += events;
+  _account->bytes += bytes;
   ++_version;
   return true;
 }
@@ -36,9 +37,15 @@ bool DailyAllowance::take(const PolicyRules& rules, std::uint64_t events, std::u
 void DailyAllowance::giveBack(std::uint64_t events, std::uint64_t bytes) {
   const Lock held(_mutex);
   beginDay();
-  _events -= std::min(_events, events);
-  _bytes -= std::min(_bytes, bytes);
+  _account->events -= std::min(_account->events, events);
+  _account->bytes -= std::min(_account->bytes, bytes);
   ++_version;
+}
+
+void DailyAllowance::countIn(platform::DayAccount& account) {
+  const Lock held(_mutex);
+  _account = &account;
+  _before = account;
 }
 
 void DailyAllowance::load() {
@@ -50,29 +57,30 @@ void DailyAllowance::load() {
   if (!read && read.error().passes()) return;
   const auto parsed = read ? formats::parseJSON(read.value()) : formats::parseJSON("{}");
   const Dictionary* kept = parsed ? parsed.value().asDictionary() : nullptr;
-  const auto number = [kept](const char* key) -> std::int64_t {
+  const auto number = [kept](const char* key) {
     const Value* value = kept ? kept->find(key) : nullptr;
-    return value ? value->toInt64().value_or(0) : 0;
+    return static_cast<std::uint64_t>(value ? value->toInt64().value_or(0) : 0);
   };
   const Lock held(_mutex);
   _loaded = true;
   beginDay();
-  if (number("day") != _day) return;
-  // Added to what has left since the start.
-  _events += static_cast<std::uint64_t>(number("events"));
-  _bytes += static_cast<std::uint64_t>(number("bytes"));
+  if (number("day") != static_cast<std::uint64_t>(_account->day)) return;
+  // Added to what has left since the start, unless the account has begun with it.
+  const bool today = _before.day == _account->day;
+  _account->events += number("events") - std::min(number("events"), today ? _before.events : 0);
+  _account->bytes += number("bytes") - std::min(number("bytes"), today ? _before.bytes : 0);
 }
 
 void DailyAllowance::beginDay() {
   const auto today = static_cast<std::int64_t>(platform::timevalToSeconds(_clock.now())) / kSecondsADay;
-  if (today == _day) return;
-  _day = today;
-  _events = _bytes = 0;
+  if (today != _account->day) *_account = {today, 0, 0};
 }
 
 std::string DailyAllowance::text() const {
   const Lock held(_mutex);
-  return formats::writeJSON(Dictionary{{"day", _day}, {"events", _events}, {"bytes", _bytes}}) + "\n";
+  return formats::writeJSON(
+             Dictionary{{"day", _account->day}, {"events", _account->events}, {"bytes", _account->bytes}}) +
+         "\n";
 }
 
 std::uint64_t DailyAllowance::version() const {

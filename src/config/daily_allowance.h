@@ -7,6 +7,7 @@
 
 #include "base/mutex.h"
 #include "config/policy.h"
+#include "platform/counters.h"
 
 namespace veltrad::platform {
 class Clock;
@@ -24,6 +25,9 @@ class DailyAllowance {
   DailyAllowance(platform::FileStore& files, const platform::Clock& clock, std::string path)
       : _files(files), _clock(clock), _path(std::move(path)) {}
 
+  // Counts there from now on, and goes on from what stands there, which outlives it and the process. To be
+  // called before anything is counted and before another thread exists.
+  void countIn(platform::DayAccount& account);
   // Reads what was counted before the start. A shortage passes: to be called again until it has been read.
   void load();
   // False, and nothing is counted, if this would go beyond a limit, or if there is one and the file has not
@@ -44,9 +48,9 @@ class DailyAllowance {
 
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   bool _loaded GUARDED_BY(_mutex) = false;
-  std::int64_t _day GUARDED_BY(_mutex) = 0;
-  std::uint64_t _events GUARDED_BY(_mutex) = 0;
-  std::uint64_t _bytes GUARDED_BY(_mutex) = 0;
+  platform::DayAccount _own GUARDED_BY(_mutex);
+  platform::DayAccount* _account GUARDED_BY(_mutex) = &_own;
+  platform::DayAccount _before GUARDED_BY(_mutex);  // what stood in the account at first
   std::uint64_t _version GUARDED_BY(_mutex) = 0;
 };
 

@@ -2,9 +2,9 @@
 // Adds up by client.
 #include "config/drop_receipt.h"
 
-#include <limits>
 #include <utility>
 
+#include "base/null_value.h"
 #include "base/text.h"
 #include "formats/json.h"
 
@@ -17,7 +17,7 @@ constexpr std::size_t kMostClients = 1024;
 constexpr std::size_t kMostOfName = 128;
 
 Value shortened(const Value* value) {
-  if (!value) return std::numeric_limits<double>::quiet_NaN();
+  if (!value) return nullValue();
   const std::string* text = value->asString();
   if (!text || text->size() <= kMostOfName) return *value;
   return std::string(withoutIncompleteEnd(std::string_view(*text).substr(0, kMostOfName))) + "…";

@@ -3,10 +3,10 @@
 #include "config/owner_gate.h"
 
 #include <algorithm>
-#include <limits>
 #include <string>
 #include <utility>
 
+#include "base/null_value.h"
 #include "config/preference_keys.h"
 #include "platform/device_secret.h"
 #include "platform/preferences.h"
@@ -32,10 +32,6 @@ std::optional<support::HistorySpace> spaceOf(const std::optional<HistoryBounds>&
   const HistoryBounds byDefault;
   return support::HistorySpace{bounds->days,
                                static_cast<std::uint64_t>(bounds->bytes.value_or(*byDefault.bytes))};
-}
-
-Value orNull(const Value* value) {
-  return value ? *value : Value(std::numeric_limits<double>::quiet_NaN());
 }
 }  // namespace
 
@@ -145,9 +141,8 @@ std::uint64_t OwnerGate::record(const http::Departure& departure, std::vector<st
 
 void OwnerGate::ended(std::uint64_t record, const http::DepartureEnd& end) {
   if (!_history || record == 0) return;
-  const double none = std::numeric_limits<double>::quiet_NaN();
-  _history->ended(record, {{"status", end.status == 0 ? Value(none) : Value(end.status)},
-                           {"error", end.error.empty() ? Value(none) : Value(end.error)},
+  _history->ended(record, {{"status", end.status == 0 ? nullValue() : end.status},
+                           {"error", end.error.empty() ? nullValue() : end.error},
                            {"transmissions", end.transmissions}});
 }
 

@@ -2,8 +2,7 @@
 // By the table of preferences, through their files.
 #include "config/preference_editor.h"
 
-#include <limits>
-
+#include "base/null_value.h"
 #include "platform/preferences.h"
 
 namespace veltrad::config {
@@ -34,7 +33,7 @@ PreferenceEditor::Answer PreferenceEditor::list() {
     keys.push_back(Dictionary{{"name", key.name()},
                               {"domain", key.domain},
                               {"type", nameOf(key.type)},
-                              {"value", value.value().value_or(std::numeric_limits<double>::quiet_NaN())},
+                              {"value", orNull(value.value())},
                               {"default", key.defaultValue(_device.isInternalBuild())},
                               {"effect", nameOf(key.effect)}});
   }

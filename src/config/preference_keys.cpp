@@ -5,8 +5,8 @@
 #include <fmt/format.h>
 
 #include <charconv>
-#include <limits>
 
+#include "base/null_value.h"
 #include "base/text.h"
 #include "platform/preferences.h"
 #include "support/veltra.h"
@@ -54,7 +54,7 @@ bool isUUID(const Value& value) {
 }
 
 Value none(bool) {
-  return std::numeric_limits<double>::quiet_NaN();
+  return nullValue();
 }
 
 template <bool B>

@@ -185,25 +185,21 @@ void Families::updateDownstreamSessions(session::FamilyFacts facts) {
   std::string key = userInfoKeyForUserInfo(facts.userInfo.get());
   const std::uint32_t sessionID = facts.sessionID;
   const bool identified = facts.userInfo != nullptr;
-  std::vector<std::string> lines;
-  {
-    const Lock held(_lock);
-    const auto at = _members.find(facts.aggregation.get());
-    if (at != _members.end()) {
-      tell(at->second, facts, key);
-      at->second.home->second.refreshLevel(at->second);
-    }
-    if (!identified) {
-      logInfo("updateDownstreamSessions: No user info found for session %u", sessionID);
-    } else if (at != _members.end()) {
-      lines = refresh(at->second);
-    }
+  platform::LateErrors late;
+  const Lock held(_lock);
+  const auto at = _members.find(facts.aggregation.get());
+  if (at != _members.end()) {
+    tell(at->second, facts, key);
+    at->second.home->second.refreshLevel(at->second);
   }
-  for (const std::string& line : lines) logError("%s", line.c_str());
+  if (!identified) {
+    logInfo("updateDownstreamSessions: No user info found for session %u", sessionID);
+  } else if (at != _members.end()) {
+    refresh(at->second, late.lines);
+  }
 }
 
-std::vector<std::string> Families::refresh(FamilyMember& member) {
-  std::vector<std::string> lines;
+void Families::refresh(FamilyMember& member, std::vector<std::string>& lines) {
   const auto shutDown = [&lines](const FamilyMember& ending) {
     const session::FamilyFacts& facts = ending.facts;
     if (auto line = facts.aggregation->shutdownSessionAggregation(facts.sessionID)) {
@@ -224,7 +220,6 @@ std::vector<std::string> Families::refresh(FamilyMember& member) {
     const bool above = member.facts.aggregation->active() || ancestorAggregates;
     if (above && below->facts.aggregation->active()) shutDown(*below);
   }
-  return lines;
 }
 
 }  // namespace veltrad::daemon

@@ -52,8 +52,8 @@ class Families {
   const FamilyMember* ancestorWithAggregator(const session::FamilyPlace& place) const REQUIRES(_lock);
   void updateCombinedSessionID(const FamilyMember& member) const REQUIRES(_lock);
   void syncReportingStates(const FamilyMember& member) const REQUIRES(_lock);
-  // Returns lines to log after the lock is released.
-  std::vector<std::string> refresh(FamilyMember& member) REQUIRES(_lock);
+  // Adds errors to `lines`.
+  void refresh(FamilyMember& member, std::vector<std::string>& lines) REQUIRES(_lock);
 
   Mutex _lock FAMILIES_LOCK;
   // Empty lists are kept, up to a bound. They have a memory pool, so that they do not keep pages alive that

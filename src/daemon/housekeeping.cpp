@@ -66,21 +66,12 @@ void Housekeeping::onceASecond() {
   attempt([this] { _daemon.startSpool(); });
   attempt([this] { _services.allowance.load(); });
   attempt([this] { _services.destinations.load(); });
-  writeStateFiles();
+  for (platform::StateFile* file :
+       {&_files.counters, &_files.metrics, &_files.allowance, &_files.destinations})
+    attempt([file] { file->writeSoon(); });
   attempt([this] { returnMemoryWhenIdle(); });
   attempt([this] {
     if (_watchdog && _services.http.passesEmptyTask(_second)) _services.serviceManager.feedWatchdog();
-  });
-}
-
-void Housekeeping::writeStateFiles() {
-  attempt([this] { _files.counters.writeSoon(); });
-  attempt([this] { _files.metrics.writeSoon(); });
-  attempt([this] {
-    if (_services.allowance.version() > 0) _files.allowance.writeSoon();
-  });
-  attempt([this] {
-    if (_services.destinations.version() > 0) _files.destinations.writeSoon();
   });
 }
 

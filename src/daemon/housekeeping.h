@@ -44,7 +44,6 @@ class Housekeeping {
   template <typename Step>
   bool attempt(const Step& step);
   void onceASecond();
-  void writeStateFiles();
   void returnMemoryWhenIdle();
   void sayShortage();
 

@@ -130,6 +130,7 @@ void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord
   }
   kept.emplace(std::move(record).value());
   services.counters.countIn(kept->counts());
+  services.allowance.countIn(kept->counts().day);
   if (const auto lost = services.counters.value(wire::Reason::daemon_ended)) {
     logInfo("main: the daemon before this one was killed, and %llu events are lost",
             static_cast<unsigned long long>(lost));
@@ -141,16 +142,16 @@ platform::StateFile::State countersState(const platform::Counters& counters, dou
           [&counters, started] { return counters.json(started); }};
 }
 
-// Never written before the first thing has left.
+// This and the next are not written before the first thing has left.
 platform::StateFile::State allowanceState(const config::DailyAllowance& allowance) {
   return {"The day's account", [&allowance] { return platform::StateFile::Version{allowance.version()}; },
-          [&allowance] { return allowance.text(); }};
+          [&allowance] { return allowance.text(); }, platform::StateFile::Version{}};
 }
 
 platform::StateFile::State destinationsState(const config::Destinations& destinations) {
   return {"What left in the last day",
           [&destinations] { return platform::StateFile::Version{destinations.version()}; },
-          [&destinations] { return destinations.text(); }};
+          [&destinations] { return destinations.text(); }, platform::StateFile::Version{}};
 }
 
 platform::StateFile::State metricsState(daemon::Observers& observers) {
@@ -189,8 +190,8 @@ bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& lis
   if (stuck == 0) services.pool.discard();  // counts the datagrams that still wait
   const bool kept = !daemon.spool() || daemon.spool()->drain(deadline - 300ms);
   services.history.writeNow(deadline - 250ms);
-  if (services.allowance.version() > 0) files.allowance.writeLast(deadline - 200ms);
-  if (services.destinations.version() > 0) files.destinations.writeLast(deadline - 150ms);
+  files.allowance.writeLast(deadline - 200ms);
+  files.destinations.writeLast(deadline - 150ms);
   const bool written = files.counters.writeLast(deadline - 100ms);
   if (stuck > 0) logWarning("main: %zu calls did not end within the time of a stop", stuck);
   if (!kept || !written) logWarning("main: the disk did not take everything within the time of a stop");

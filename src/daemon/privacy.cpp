@@ -6,11 +6,11 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
-#include <limits>
 #include <memory>
 
 #include "backends/backend_factory.h"
 #include "backends/https/post_spool.h"
+#include "base/null_value.h"
 #include "config/preference_keys.h"
 #include "daemon/veltrad_agent.h"
 #include "platform/log.h"
@@ -27,7 +27,6 @@ constexpr auto kHTTPPatience = 500ms;
 // Posts may be on their way to the disk.
 constexpr auto kSpoolPatience = 5s;
 constexpr std::string_view kCustomIdentifier = "uuid:";
-constexpr double kNotGiven = std::numeric_limits<double>::quiet_NaN();
 
 bool isIdentifier(std::string_view key) {
   return key == support::kIdentifierRespectingConsent || key == support::kIdentifierOverridingConsent ||
@@ -50,7 +49,7 @@ std::uint64_t bytesIn(const std::string& directory, std::string_view beginning) 
 
 Value dateOrNull(const Value* value) {
   const Date* date = value ? value->asDate() : nullptr;
-  return date ? date->secondsSince1970 : kNotGiven;
+  return date ? date->secondsSince1970 : nullValue();
 }
 
 }  // namespace
@@ -93,10 +92,8 @@ Privacy::Answer Privacy::show() {
   const auto word = _services.gate.word();
   const auto& given = consent.value();
   return Dictionary{{"reporting", reporting()},
-                    {"consent", given ? Value(given->toBoolean().value_or(false)) : Value(kNotGiven)},
-                    {"policy", word->policy->broken()    ? Value("broken")
-                               : word->policy->asGiven() ? Value(*word->policy->asGiven())
-                                                         : Value(kNotGiven)},
+                    {"consent", given ? Value(given->toBoolean().value_or(false)) : nullValue()},
+                    {"policy", word->policy->broken() ? Value("broken") : orNull(word->policy->asGiven())},
                     {"identifiers", std::move(known.value())},
                     {"destinations", _services.destinations.lastDay()}};
 }

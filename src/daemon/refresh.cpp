@@ -4,8 +4,7 @@
 
 #include <fmt/format.h>
 
-#include <limits>
-
+#include "base/null_value.h"
 #include "base/text.h"
 #include "config/client_types.h"
 #include "config/storebag_source.h"
@@ -14,8 +13,6 @@
 namespace veltrad::daemon {
 
 namespace {
-
-constexpr double kNone = std::numeric_limits<double>::quiet_NaN();
 
 const char* resultOf(const config::StorebagAnswer& answer) {
   using Cause = config::StorebagCause;
@@ -36,7 +33,7 @@ const char* resultOf(const config::StorebagAnswer& answer) {
 }
 
 Value reasonOf(const config::StorebagAnswer& answer) {
-  if (answer.cause == config::StorebagCause::none) return kNone;
+  if (answer.cause == config::StorebagCause::none) return nullValue();
   return answer.status >= 400 ? fmt::format("HTTP {}: {}", answer.status, answer.why) : answer.why;
 }
 
@@ -60,9 +57,9 @@ Result<Dictionary, std::string> refreshStorebag(StorebagCache& cache, const std:
   const auto version = cache.versionForClientType(*clientType);
   return Dictionary{{"name", name},
                     {"result", resultOf(answer)},
-                    {"signature", answer.genuine ? Value(*answer.genuine ? "good" : "bad") : Value(kNone)},
+                    {"signature", answer.genuine ? Value(*answer.genuine ? "good" : "bad") : nullValue()},
                     {"reason", reasonOf(answer)},
-                    {"version", version ? Value(*version) : Value(kNone)}};
+                    {"version", orNull(version)}};
 }
 
 }  // namespace veltrad::daemon

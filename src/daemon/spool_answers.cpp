@@ -5,10 +5,10 @@
 #include <algorithm>
 #include <chrono>
 #include <cstdint>
-#include <limits>
 #include <vector>
 
 #include "backends/https/post_spool.h"
+#include "base/null_value.h"
 #include "base/text.h"
 
 namespace veltrad::daemon {
@@ -18,7 +18,6 @@ namespace {
 using backends::PostSpool;
 using backends::SpoolQueue;
 
-constexpr double kNoAnswer = std::numeric_limits<double>::quiet_NaN();
 // So that an answer fits into a frame.
 constexpr std::size_t kMostPosts = 500;
 constexpr std::size_t kMostAddresses = 256;
@@ -34,16 +33,11 @@ double secondsOfOrder(std::uint64_t order) {
 }
 
 Value knownOrNull(double time) {
-  return time > 0 ? time : kNoAnswer;
+  return time > 0 ? time : nullValue();
 }
 
 Value knownOrNull(const std::string& text) {
-  return text.empty() ? Value(kNoAnswer) : Value(text);
-}
-
-Value knownOrNull(const Dictionary& from, const char* key) {
-  const Value* value = from.find(key);
-  return value ? *value : Value(kNoAnswer);
+  return text.empty() ? nullValue() : text;
 }
 
 Dictionary lineOfPost(const support::SpoolEntry& entry, const support::SpoolPlace& place,
@@ -59,15 +53,15 @@ Dictionary lineOfPost(const support::SpoolEntry& entry, const support::SpoolPlac
                   {"lastError", knownOrNull(place.tries > entry.tries ? address.lastError : entry.lastError)},
                   {"nextTry", knownOrNull(address.nextTry)}};
   for (const char* key : {"clientType", "sessionID", "client", "service"})
-    line.set(key, knownOrNull(entry.client, key));
-  for (const char* key : {"backend", "storebag", "entry"}) line.set(key, knownOrNull(entry.about, key));
+    line.set(key, orNull(entry.client.find(key)));
+  for (const char* key : {"backend", "storebag", "entry"}) line.set(key, orNull(entry.about.find(key)));
   return line;
 }
 
 }  // namespace
 
 Value statusOfSpool(PostSpool* spool) {
-  if (!spool) return kNoAnswer;
+  if (!spool) return nullValue();
   const auto amount = spool->queue().amount();
   Array addresses;
   for (const SpoolQueue::AddressStatus& one : spool->queue().addresses()) {
@@ -98,10 +92,9 @@ Result<Dictionary, std::string> spoolPage(PostSpool* spool, const Dictionary& ar
     if (bytes > kMostListedBytes) break;
     after = name.order;
     const auto entry = spool->read(name).entry;
-    SpoolQueue::AddressStatus address;
-    const auto place = spool->queue().place(name.order, address);
+    const auto place = spool->queue().place(name.order);
     if (!entry || !place) continue;  // it has left
-    posts.push_back(lineOfPost(*entry, *place, address));
+    posts.push_back(lineOfPost(*entry, *place, spool->queue().statusAt(place->address)));
     bytes += keptBytes(posts.back());
   }
   Dictionary page{{"posts", std::move(posts)}};

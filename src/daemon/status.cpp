@@ -9,9 +9,9 @@
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
-#include <limits>
 #include <memory>
 
+#include "base/null_value.h"
 #include "base/text.h"
 #include "base/version.h"
 #include "config/client_types.h"
@@ -24,17 +24,11 @@ namespace veltrad::daemon {
 
 namespace {
 
-constexpr double kNotKnown = std::numeric_limits<double>::quiet_NaN();
-
-Value numberOrNull(const std::optional<double>& number) {
-  return number.value_or(kNotKnown);
-}
-
 // Clients choose their names and may choose long ones: a reply must hold those of many sessions.
 constexpr std::size_t kLongestText = 256;  // bytes
 
 Value textOrNull(const std::string* text) {
-  if (!text) return kNotKnown;
+  if (!text) return nullValue();
   return withoutIncompleteEnd(std::string_view(*text).substr(0, kLongestText));
 }
 
@@ -42,11 +36,11 @@ Dictionary statusOfStorebag(const char* name, const StorebagRecord& record, doub
   const bool attempted = record.attempted;
   return {{"name", name},
           {"version", textOrNull(record.version ? &*record.version : nullptr)},
-          {"age", attempted ? std::abs(now - record.fetchTime) : kNotKnown},
+          {"age", attempted ? std::abs(now - record.fetchTime) : nullValue()},
           {"state", !attempted               ? "never"
                     : record.fetchSuccessful ? "successful"
                                              : "failed"},
-          {"nextAttempt", attempted ? record.fetchTime + record.wait(jitter) : kNotKnown},
+          {"nextAttempt", attempted ? record.fetchTime + record.wait(jitter) : nullValue()},
           {"refusal", textOrNull(record.refusal.empty() ? nullptr : &record.refusal)}};
 }
 
@@ -59,7 +53,7 @@ Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
           {"reason", Dictionary{{"name", reason.name}, {"text", reason.text}}},
           {"held", activity.held},
           {"underWay", activity.underWay},
-          {"lastOutcome", activity.lastOutcome.empty() ? Value(kNotKnown) : Value(activity.lastOutcome)}};
+          {"lastOutcome", activity.lastOutcome.empty() ? nullValue() : activity.lastOutcome}};
 }
 
 Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord& word) {
@@ -75,7 +69,7 @@ Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord
     for (const auto& [name, backend] : *facts.backends) backends.push_back(statusOfBackend(*backend));
   }
   return {{"id", listed.number},
-          {"clientType", clientType ? Value(*clientType) : Value(kNotKnown)},
+          {"clientType", orNull(clientType)},
           {"sessionID", facts.sessionID},
           {"clientName", textOrNull(user.string(wire::kVeltraUserInfoClientName))},
           {"serviceName", textOrNull(user.string(wire::kVeltraUserInfoServiceName))},
@@ -119,7 +113,7 @@ Dictionary statusOfDaemon(const DaemonFacts& facts) {
       {"memory", Dictionary{{"resident", residentBytes()}}},
       {"limits", std::move(limits)},
       {"clock", facts.now < kEarliestTime ? Value("before this program was made: no storebag expires by it")
-                                          : Value(kNotKnown)}};
+                                          : nullValue()}};
 }
 
 Array statusOfStorebags(StorebagCache& cache, double now) {
@@ -136,7 +130,7 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers) {
   Array all;
   for (const http::ServerRecord& server : servers) {
     all.push_back(Dictionary{{"address", server.address},
-                             {"lastSuccess", numberOrNull(server.lastSuccess)},
+                             {"lastSuccess", orNull(server.lastSuccess)},
                              {"failures", server.failures}});
   }
   return all;

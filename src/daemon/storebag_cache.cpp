@@ -22,7 +22,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
   if (name) {
     const Lock held(_lock);
     StorebagRecord& record = settledRecord(name);
-    const auto section = used(record);
+    auto section = used(record);
     const CacheVerdict verdict = verdictOf(record);
     // What has expired while it was fresh is asked for again.
     if (verdict == CacheVerdict::serve && (section || !record.data)) {

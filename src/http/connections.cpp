@@ -62,11 +62,6 @@ bool isHashed(const char* directory) {
 
 }  // namespace
 
-bool Connections::Stamp::operator==(const Stamp& other) const {
-  return device == other.device && file == other.file && size == other.size &&
-         modified.tv_sec == other.modified.tv_sec && modified.tv_nsec == other.modified.tv_nsec;
-}
-
 void Connections::Free::operator()(X509_STORE* store) const {
   X509_STORE_free(store);
 }
@@ -101,22 +96,15 @@ bool Connections::ended(int localPort) const {
 }
 
 X509_STORE* Connections::trusted() {
-  const std::optional<Stamp> now = stampNow();  // first, so that a file that changes meanwhile is read again
-  if (now && (!_store || !(*now == _stamp))) {
-    if (Store fresh = makeStore(now->size >= 0)) {
+  // First, so that a file that changes meanwhile is read again. Fails only during a shortage.
+  const auto now = platform::DiskFileStore().stamp(_extraCertificatesPath);
+  if (now && (!_store || now.value() != _stamp)) {
+    if (Store fresh = makeStore(now.value().has_value())) {
       _store = std::move(fresh);
-      _stamp = *now;
+      _stamp = now.value();
     }
   }
   return _store.get();
-}
-
-std::optional<Connections::Stamp> Connections::stampNow() const {
-  struct stat found {};
-  if (_extraCertificatesPath.empty()) return Stamp{};
-  if (stat(_extraCertificatesPath.c_str(), &found) == 0)
-    return Stamp{found.st_dev, found.st_ino, found.st_size, found.st_mtim};
-  return platform::isShortage(errno) ? std::nullopt : std::optional(Stamp{});
 }
 
 Connections::Store Connections::makeStore(bool withExtra) const {

@@ -3,12 +3,12 @@
 #pragma once
 
 #include <curl/curl.h>
-#include <sys/stat.h>
 
 #include <memory>
-#include <optional>
 #include <string>
 #include <vector>
+
+#include "platform/file_store.h"
 
 // As in OpenSSL's headers.
 using X509_STORE = struct x509_store_st;
@@ -40,27 +40,18 @@ class Connections {
   X509_STORE* trusted();
 
  private:
-  struct Stamp {
-    dev_t device = 0;
-    ino_t file = 0;
-    off_t size = -1;
-    timespec modified{};
-    bool operator==(const Stamp& other) const;
-  };
   struct Free {
     void operator()(X509_STORE* store) const;
   };
   using Store = std::unique_ptr<X509_STORE, Free>;
 
-  // Absent during a shortage.
-  std::optional<Stamp> stampNow() const;
   // Null if it would be incomplete because of a shortage.
   Store makeStore(bool withExtra) const;
 
   std::vector<curl_socket_t> _sockets;
   const std::string _extraCertificatesPath;
   Store _store;
-  Stamp _stamp;
+  platform::FileStamp _stamp;  // of the extra file, when the store was made
 };
 
 }  // namespace veltrad::http

@@ -3,6 +3,7 @@
 #include "ipc/entitlements.h"
 
 #include <algorithm>
+#include <new>
 #include <utility>
 
 #include "platform/log.h"
@@ -124,11 +125,18 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
 
 Entitlements::Entitlements(platform::FileStore& files, const std::string& path) : _file(files, path) {}
 
-// Log lines, written after the lock was released.
+// What is to be logged, once the lock was released.
 struct Entitlements::Said {
+  explicit Said(Entitlements& whose) : _whose(whose) {}
+  Said(const Said&) = delete;
+  ~Said() { _whose.say(*this); }
+
   std::optional<std::string> error;
   std::optional<std::string> shortage;
   std::vector<std::string> warnings;
+
+ private:
+  Entitlements& _whose;
 };
 
 void Entitlements::refresh(Said& said) {
@@ -147,61 +155,45 @@ void Entitlements::refresh(Said& said) {
 }
 
 void Entitlements::readAgain() {
-  Said said;
-  {
-    Lock lock(_mutex);
-    _file.readAgain();
-    refresh(said);
-  }
-  say(said);
+  Said said(*this);
+  const Lock lock(_mutex);
+  _file.readAgain();
+  refresh(said);
 }
 
 std::optional<Value> Entitlements::valueForEntitlement(std::string_view name, const Peer& peer) {
-  Said said;
-  std::optional<Value> found;
-  {
-    Lock lock(_mutex);
-    refresh(said);
-    found = entitlementInRules(_rules, name, peer);
-  }
-  say(said);
-  return found;
+  Said said(*this);
+  const Lock lock(_mutex);
+  refresh(said);
+  return entitlementInRules(_rules, name, peer);
 }
 
 std::optional<RulesState> Entitlements::stateFor(std::string_view name) {
-  Said said;
-  std::optional<RulesState> state;
-  {
-    Lock lock(_mutex);
-    refresh(said);
-    if (!said.shortage) {
-      state = _state;
-      state->grants = anybodyIsGranted(_rules, name);
-    }
-  }
-  say(said);
+  Said said(*this);
+  const Lock lock(_mutex);
+  refresh(said);
+  if (said.shortage) return std::nullopt;
+  RulesState state = _state;
+  state.grants = anybodyIsGranted(_rules, name);
   return state;
 }
 
 bool Entitlements::mayHold(std::string_view name, unsigned uid) {
-  Said said;
-  bool may = false;
-  {
-    Lock lock(_mutex);
-    refresh(said);
-    may = mayHoldByRules(_rules, name, uid);
-  }
-  say(said);
-  return may;
+  Said said(*this);
+  const Lock lock(_mutex);
+  refresh(said);
+  return mayHoldByRules(_rules, name, uid);
 }
 
 void Entitlements::say(const Said& said) {
   if (said.error) logError("Entitlements could not be read, nothing is granted: %s", said.error->c_str());
   for (const std::string& warning : said.warnings) logWarning("Entitlements: %s", warning.c_str());
-  if (said.shortage) {
+  if (!said.shortage) return;
+  try {
     const auto line = _shortages.happened("Entitlements could not be read just now, the last rules stand: " +
                                           *said.shortage);
     if (line) logWarning("%s", line->c_str());
+  } catch (const std::bad_alloc&) {  // said the next time
   }
 }
 

@@ -11,11 +11,20 @@
 
 namespace veltrad::platform {
 
+// What has left the device on a day of UTC.
+struct DayAccount {
+  std::int64_t day = 0;  // since 1970
+  std::uint64_t events = 0;
+  std::uint64_t bytes = 0;
+};
+
 // What a process has counted. It may lie in a file that outlives the process (counts_record.h).
 struct Counts {
   // Events that a back end has taken in. Each is later counted under one reason, as posted, lost or dropped.
   std::atomic<std::uint64_t> eventsTaken{0};
   std::array<std::atomic<std::uint64_t>, wire::kReasonCount> ofReason{};
+  // Goes on with each process. Who counts it guards it.
+  DayAccount day;
 };
 
 // The file run/veltrad/counters.json is {"pid": n, "started": seconds since 1970, "counts": {text: n}}, with

@@ -98,6 +98,7 @@ Result<CountsRecord, std::string> CountsRecord::open(const std::string& path, Fi
   const bool readable = record._block->table == fresh.table;
   fresh.counts.ofReason[static_cast<std::size_t>(wire::Reason::daemon_ended)] =
       readable ? lostBy(*record._block, files, countersPath) : 0;
+  if (readable) fresh.counts.day = record._block->counts.day;
   // At once, as far as a kill is concerned: the old numbers stand there until the new ones do.
   if (::pwrite(file.get(), static_cast<const void*>(&fresh), sizeof fresh, 0) != sizeof fresh) {
     return Failure{failure(path, errno)};

@@ -18,8 +18,8 @@ class FileStore;
 class CountsRecord {
  public:
   // Opens the file (mode 0600), which belongs to whoever holds the daemon's lock, and maps it. It then holds
-  // the counts of this process, which begin with what the one before has lost. `countersPath`: the counters
-  // file, as that one left it. Fails if the file cannot be made or mapped.
+  // the counts of this process, which begin with what the one before has lost and with its account of the
+  // day. `countersPath`: the counters file, as that one left it. Fails if the file cannot be made or mapped.
   static Result<CountsRecord, std::string> open(const std::string& path, FileStore& files,
                                                 const std::string& countersPath, double startedAt);
   CountsRecord(CountsRecord&& other) noexcept;

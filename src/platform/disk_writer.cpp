@@ -3,8 +3,9 @@
 #include "platform/disk_writer.h"
 
 #include <algorithm>
+#include <future>
+#include <memory>
 #include <new>
-#include <system_error>
 
 #include "platform/log.h"
 
@@ -14,6 +15,17 @@ DiskWriter::Queue::Queue(DiskWriter& writer, std::size_t most) : _writer(writer)
 
 DiskWriter::Queue::~Queue() {
   _writer.close(_lane);
+}
+
+bool DiskWriter::Queue::run(Job job, std::chrono::steady_clock::time_point deadline) {
+  // The job's, because it may outlive this call. Its end is noticed if it throws, too.
+  const auto done = std::make_shared<std::promise<void>>();
+  const auto ran = done->get_future();
+  const auto whole = [job = std::move(job), done] {
+    job();
+    done->set_value();
+  };
+  return put(whole, 1) == Put::taken && ran.wait_until(deadline) == std::future_status::ready;
 }
 
 DiskWriter::Lanes::iterator DiskWriter::open(std::size_t most) {
@@ -43,14 +55,14 @@ DiskWriter::Queue::Put DiskWriter::put(Lanes::iterator lane, Job job, std::size_
 }
 
 DiskWriter::~DiskWriter() {
-  std::thread thread;
+  Thread thread;
   {
     const Lock held(_mutex);
     _ends = true;
     _news.notifyOne();
-    thread.swap(_thread);
+    thread = std::move(_thread);
   }
-  if (thread.joinable()) thread.join();
+  thread.join();
 }
 
 bool DiskWriter::start() {
@@ -59,15 +71,7 @@ bool DiskWriter::start() {
 }
 
 bool DiskWriter::startThread() {
-  if (_thread.joinable()) return true;
-  try {
-    _thread = std::thread([this] { run(); });
-  } catch (const std::system_error&) {
-    return false;
-  } catch (const std::bad_alloc&) {
-    return false;
-  }
-  return true;
+  return _thread.running() || _thread.start("disk", kConnectionStackBytes, [this] { run(); });
 }
 
 DiskWriter::Lane* DiskWriter::takeTurn() {

@@ -7,10 +7,10 @@
 #include <deque>
 #include <functional>
 #include <list>
-#include <thread>
 #include <utility>
 
 #include "base/mutex.h"
+#include "base/thread.h"
 
 namespace veltrad::platform {
 
@@ -49,6 +49,9 @@ class DiskWriter {
 
     // Never waits. full: too many bytes wait before it. noThread: none can be started for now.
     Put put(Job job, std::size_t bytes) { return _writer.put(_lane, std::move(job), bytes); }
+    // Puts a job and waits until it has run, or has failed for want of memory. False if it is not taken, or
+    // `deadline` passed first: then it may still run.
+    bool run(Job job, std::chrono::steady_clock::time_point deadline);
 
    private:
     DiskWriter& _writer;
@@ -79,7 +82,7 @@ class DiskWriter {
   Condition _done;
   Lanes _lanes GUARDED_BY(_mutex);
   bool _ends GUARDED_BY(_mutex) = false;
-  std::thread _thread GUARDED_BY(_mutex);
+  Thread _thread GUARDED_BY(_mutex);
 };
 
 }  // namespace veltrad::platform

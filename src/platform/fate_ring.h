@@ -24,7 +24,6 @@ namespace veltrad::platform {
 // refresh() older, so that it knows them as long as it stands, but for the oldest few entries of the ring.
 class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its counters have a cache line alone
  public:
-  static constexpr std::size_t kDefaultBytes = 512u << 10;
   static constexpr std::size_t kLeastBytes = 64u << 10;
   static constexpr std::size_t kMostBytes = 256u << 20;
   static constexpr std::size_t kLongestText = 2048;

@@ -13,6 +13,7 @@
 #include <functional>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace veltrad::platform {
 
@@ -42,6 +43,16 @@ void setSink(Sink sink);
 #define logWarning(...) VELTRA_LOG_AT(::veltrad::platform::LogLevel::warning, __VA_ARGS__)
 #define logInfo(...) VELTRA_LOG_AT(::veltrad::platform::LogLevel::info, __VA_ARGS__)
 #define logDebug(...) VELTRA_LOG_AT(::veltrad::platform::LogLevel::debug, __VA_ARGS__)
+
+// Error lines that are logged when it goes: after the locks that were taken since it was made.
+struct LateErrors {
+  LateErrors() = default;
+  LateErrors(const LateErrors&) = delete;
+  ~LateErrors() {
+    for (const std::string& line : lines) logError("%s", line.c_str());
+  }
+  std::vector<std::string> lines;
+};
 
 class VeltraLogging {
  public:

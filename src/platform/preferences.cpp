@@ -13,10 +13,6 @@ namespace veltrad::platform {
 
 namespace {
 
-void logAll(const std::vector<std::string>& complaints) {
-  for (const std::string& line : complaints) logError("%s", line.c_str());
-}
-
 std::string nameOf(std::string_view domain, std::string_view key) {
   return std::string(domain) + " " + std::string(key);
 }
@@ -37,91 +33,65 @@ FilePreferences::FilePreferences(FileStore& files, std::string directory)
     : _files(files), _directory(std::move(directory)) {}
 
 Preferences::Found FilePreferences::lookUp(std::string_view domain, std::string_view key) {
-  Complaints complaints;
-  Found found = std::optional<Value>();
-  {
-    Lock lock(_mutex);
-    const auto all = known(domain, complaints);
-    const Value* value = all ? all.value().find(key) : nullptr;
-    if (!value) value = _unstored.find(nameOf(domain, key));
-    if (value) {
-      found = std::optional(*value);
-    } else if (!all) {
-      found = Failure{all.error()};
-    }
-  }
-  logAll(complaints);
-  return found;
+  LateErrors late;
+  const Lock lock(_mutex);
+  const auto all = known(domain, late.lines);
+  const Value* value = all ? all.value().find(key) : nullptr;
+  if (!value) value = _unstored.find(nameOf(domain, key));
+  if (value) return std::optional(*value);
+  if (!all) return Failure{all.error()};
+  return std::optional<Value>();
 }
 
 Result<Done, std::string> FilePreferences::change(std::string_view domain, std::string_view key,
                                                   const std::optional<Value>& value) {
-  Complaints complaints;
-  auto changed = [&] {
-    Lock lock(_mutex);
-    auto written = write(
-        domain, key,
-        [&](Dictionary& all) {
-          if (!value) return all.erase(key);
-          all.set(std::string(key), *value);
-          return true;
-        },
-        complaints);
-    if (written) _unstored.erase(nameOf(domain, key));
-    return written;
-  }();
-  logAll(complaints);
-  return changed;
+  LateErrors late;
+  const Lock lock(_mutex);
+  auto written = write(
+      domain, key,
+      [&](Dictionary& all) {
+        if (!value) return all.erase(key);
+        all.set(std::string(key), *value);
+        return true;
+      },
+      late.lines);
+  if (written) _unstored.erase(nameOf(domain, key));
+  return written;
 }
 
 Result<Done, std::string> FilePreferences::edit(std::string_view domain, std::string_view what,
                                                 const Edit& edit) {
-  Complaints complaints;
-  auto changed = [&]() -> Result<Done, std::string> {
-    Lock lock(_mutex);
-    auto written = write(domain, what, edit, complaints);
-    if (written) _unstored = {};
-    return written;
-  }();
-  logAll(complaints);
-  return changed;
+  LateErrors late;
+  const Lock lock(_mutex);
+  auto written = write(domain, what, edit, late.lines);
+  if (written) _unstored = {};
+  return written;
 }
 
 Result<Dictionary, FileFailure> FilePreferences::all(std::string_view domain) {
-  Complaints complaints;
-  auto found = [&] {
-    Lock lock(_mutex);
-    return known(domain, complaints);
-  }();
-  logAll(complaints);
-  return found;
+  LateErrors late;
+  const Lock lock(_mutex);
+  return known(domain, late.lines);
 }
 
 std::optional<std::string> FilePreferences::textOrStore(std::string_view domain, std::string_view key,
                                                         std::string (*make)()) {
-  Complaints complaints;
-  std::optional<std::string> text;
-  {
-    Lock lock(_mutex);
-    const auto all = known(domain, complaints);
-    const Value* found = all ? all.value().find(key) : nullptr;
-    text = found ? found->toText() : std::nullopt;
-    if (!text || text->empty()) {
-      const std::string name = nameOf(domain, key);
-      const std::string* unstored = _unstored.string(name);
-      Complaints said;  // not logged: this was done when the text was made
-      if (unstored) {
-        text = *unstored;
-        if (store(domain, key, *text, said)) _unstored.erase(name);
-      } else if (all) {
-        text = make();
-        if (!store(domain, key, *text, complaints)) _unstored.set(name, *text);
-      } else {
-        text = std::nullopt;
-      }
-    }
+  LateErrors late;
+  const Lock lock(_mutex);
+  const auto all = known(domain, late.lines);
+  const Value* found = all ? all.value().find(key) : nullptr;
+  auto text = found ? found->toText() : std::nullopt;
+  if (text && !text->empty()) return text;
+  const std::string name = nameOf(domain, key);
+  if (const std::string* unstored = _unstored.string(name)) {
+    text = *unstored;
+    Complaints said;  // not logged: this was done when the text was made
+    if (store(domain, key, *text, said)) _unstored.erase(name);
+    return text;
   }
-  logAll(complaints);
+  if (!all) return std::nullopt;
+  text = make();
+  if (!store(domain, key, *text, late.lines)) _unstored.set(name, *text);
   return text;
 }
 

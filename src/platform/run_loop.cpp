@@ -1,10 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-// The main run loop, which waits on a signal descriptor and a wake-up descriptor.
+// The main run loop, which waits on a signal descriptor.
 #include "platform/run_loop.h"
 
 #include <poll.h>
 #include <signal.h>
-#include <sys/eventfd.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
 
@@ -58,10 +57,6 @@ Signals signalsIn(int descriptor) {
 
 }  // namespace
 
-RunLoop::RunLoop() : _wakeup(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-  if (!_wakeup.isOpen()) std::abort();
-}
-
 void RunLoop::blockSignals() {
   ::signal(SIGPIPE, SIG_IGN);
   ::signal(SIGXFSZ, SIG_IGN);  // the write then fails
@@ -75,34 +70,23 @@ int RunLoop::run(std::chrono::milliseconds interval, const std::function<void()>
                  const std::function<void()>& hangUp) {
   using SteadyClock = std::chrono::steady_clock;
   auto next = SteadyClock::now() + interval;
-  int signal = 0;
   while (true) {
-    pollfd descriptors[] = {{_signals.get(), POLLIN, 0}, {_wakeup.get(), POLLIN, 0}};
+    pollfd waited{_signals.get(), POLLIN, 0};
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(next - SteadyClock::now()).count();
-    const int ready = ::poll(descriptors, std::size(descriptors),
-                             static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000)));
+    const int ready = ::poll(&waited, 1, static_cast<int>(std::clamp<std::int64_t>(left, 0, 60'000)));
     if (ready < 0 && errno != EINTR) std::abort();
-    if (ready > 0 && descriptors[0].revents != 0) {
+    if (ready > 0) {
       const Signals come = signalsIn(_signals.get());
       if (come.ending) {
-        signal = *come.ending;
-        break;
+        letASecondSignalEndTheProcess();
+        return *come.ending;
       }
       if (come.hangUp) hangUp();
     }
-    if (ready > 0 && descriptors[1].revents != 0) break;
     if (SteadyClock::now() < next) continue;
     tick();
     next = std::max(next + interval, SteadyClock::now());  // missed ticks are not repeated
   }
-  letASecondSignalEndTheProcess();
-  return signal;
-}
-
-void RunLoop::stop() {
-  const std::uint64_t one = 1;
-  // EAGAIN: a wake-up is pending already.
-  if (::write(_wakeup.get(), &one, sizeof one) < 0 && errno != EAGAIN) std::abort();
 }
 
 }  // namespace veltrad::platform

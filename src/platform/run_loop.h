@@ -11,21 +11,15 @@ namespace veltrad::platform {
 
 class RunLoop {
  public:
-  RunLoop();
-
   // Blocks SIGTERM, SIGINT and SIGHUP, which then arrive through the loop, and ignores SIGPIPE and SIGXFSZ.
   void blockSignals();
-  // Calls `tick` every `interval`, and `hangUp` after SIGHUP, until SIGTERM, SIGINT or stop(). Returns the
-  // signal's number, 0 after stop(). After it has returned, a second signal ends the process at once with
-  // status 1.
+  // Calls `tick` every `interval`, and `hangUp` after SIGHUP, until SIGTERM or SIGINT, whose number it
+  // returns. After it has returned, a second signal ends the process at once with status 1.
   int run(std::chrono::milliseconds interval, const std::function<void()>& tick,
           const std::function<void()>& hangUp);
-  // Any thread.
-  void stop();
 
  private:
   FileDescriptor _signals;
-  FileDescriptor _wakeup;
 };
 
 }  // namespace veltrad::platform

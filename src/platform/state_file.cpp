@@ -16,6 +16,7 @@ StateFile::StateFile(State state, FileStore& files, DiskWriter& writer, std::str
       _files(files),
       _writer(writer),
       _path(std::move(path)),
+      _written(_state.silent),
       _queue(writer, kMostRequestBytes) {}
 
 bool StateFile::writeSoon() {

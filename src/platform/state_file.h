@@ -29,6 +29,8 @@ class StateFile {
     std::function<Version()> version;
     // What the file holds.
     std::function<std::string()> text;
+    // At this version there is nothing to say yet, and no file.
+    std::optional<Version> silent = {};
   };
 
   StateFile(State state, FileStore& files, DiskWriter& writer, std::string path);

@@ -2,17 +2,15 @@
 // Makes the back ends of a session and reads their states.
 #include "session/backend_set.h"
 
-#include <limits>
 #include <utility>
 
+#include "base/null_value.h"
 #include "platform/log.h"
 #include "wire/constants.h"
 
 namespace veltrad::session {
 
 namespace {
-constexpr double kNoVersion = std::numeric_limits<double>::quiet_NaN();
-
 // The back end of this name; null: there is none.
 backends::VeltraBackend* named(const BackendSet* set, const std::string& name) {
   const auto at = set ? set->find(name) : BackendSet::const_iterator();
@@ -50,9 +48,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
   facts.client = backends::clientOf(facts);
   const config::StorebagOrigin& origin = storebag->origin;
   facts.storebag = std::make_shared<const Dictionary>(
-      Dictionary{{"name", origin.name},
-                 {"version", origin.version ? Value(*origin.version) : Value(kNoVersion)},
-                 {"section", origin.section}});
+      Dictionary{{"name", origin.name}, {"version", orNull(origin.version)}, {"section", origin.section}});
 
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   auto made = std::make_shared<BackendSet>();

@@ -72,7 +72,7 @@ bool VeltradSession::setSessionInfo(wire::OptionalDictionary sessionInfo, wire::
     logWarning("setSessionInfo: Configure session: user info provided without requiring it");
   }
   _sessionInfo = std::move(info);
-  keepUserInfo(std::move(identity));
+  keepUserInfo(identity);
   _aggregation->setActive(hasAggregationBlock);
   _sessionDelegate.sessionInfoUpdated(familyFacts());
   return true;
@@ -85,9 +85,9 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
   return kept != nullptr;
 }
 
-void VeltradSession::keepUserInfo(backends::SharedDictionary info) {
+void VeltradSession::keepUserInfo(const backends::SharedDictionary& info) {
   _saidWithoutUserInfo = false;
-  _userInfo = _word.allowed(std::move(info));
+  _userInfo = _word.allowed(info);
   _fates.forget();
 }
 
@@ -166,11 +166,11 @@ void VeltradSession::fetchStatesWithUserInfo(wire::OptionalDictionary userInfo,
   logDebug("fetchStatesWithUserInfo: Fetching states for session %u", _sessionID);
   hearOwner();
   backends::SharedDictionary identity;
-  if (charged(std::move(userInfo), identity)) receivedUserInfo(std::move(identity));
+  if (charged(std::move(userInfo), identity)) receivedUserInfo(identity);
   if (completionHandler) completionHandler(fetchReportingStates());
 }
 
-void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
+void VeltradSession::receivedUserInfo(const backends::SharedDictionary& updated) {
   const backends::SharedDictionary current = _userInfo.given;
   if (!updated) {
     if (!current) return;
@@ -178,7 +178,7 @@ void VeltradSession::receivedUserInfo(backends::SharedDictionary updated) {
       return;
   }
   const bool unchanged = current && updated && sameClient(*current, *updated);
-  keepUserInfo(std::move(updated));
+  keepUserInfo(updated);
   if (_backends) {
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
   }

@@ -94,10 +94,10 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void createBackends(const BackendSet* before);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
-  void receivedUserInfo(backends::SharedDictionary userInfo);
+  void receivedUserInfo(const backends::SharedDictionary& userInfo);
   // Charges the dictionary to the user. False, and counted, if it is too much.
   bool charged(wire::OptionalDictionary given, backends::SharedDictionary& kept);
-  void keepUserInfo(backends::SharedDictionary info);
+  void keepUserInfo(const backends::SharedDictionary& info);
   // Whose message it is; those of the session itself are not counted as lost.
   using Origin = SessionFates::From;
   // Hears the owner's word first.

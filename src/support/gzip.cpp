@@ -172,21 +172,14 @@ std::optional<std::string> GzipCompressor::deflateAtOnce(const std::vector<std::
   }
   Deflation& deflation = *taken;
   std::string output;
-  deflation.emptyRoom();
+  const ByteSink sink = [&output](std::string_view bytes) {
+    output.append(bytes);
+    return true;
+  };
   for (std::size_t i = 0; i < pieces.size(); ++i) {
-    const bool last = i + 1 == pieces.size();
     deflation.give(pieces[i].data(), pieces[i].size());
-    int result = deflation.run(last ? Z_FINISH : Z_NO_FLUSH);
-    for (; result == Z_OK && deflation.full(); result = deflation.run(last ? Z_FINISH : Z_NO_FLUSH)) {
-      output.append(deflation.made());
-      deflation.emptyRoom();
-    }
-    const bool nothingToDo = result == Z_BUF_ERROR && !last;
-    if (result == Z_STREAM_END || (result == Z_OK && !last) || nothingToDo) continue;
-    deflation.sayFailure(result);
-    return std::nullopt;
+    if (!append(deflation, i + 1 == pieces.size() ? Z_FINISH : Z_NO_FLUSH, sink)) return std::nullopt;
   }
-  output.append(deflation.made());
   output.shrink_to_fit();  // it may wait for a server for a long time
   sayCompressed(deflation.stream.total_in, output.size());
   const Lock held(_mutex);

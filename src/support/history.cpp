@@ -8,7 +8,6 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <future>
 #include <new>
 
 #include "base/text.h"
@@ -186,38 +185,17 @@ void History::write() {
 }
 
 bool History::writeNow(std::chrono::steady_clock::time_point deadline) {
-  const auto done = std::make_shared<std::promise<void>>();
-  auto written = done->get_future();
-  using Put = platform::DiskWriter::Queue::Put;
-  const auto put = _queue.put(
-      [this, done] {
-        try {
-          write();
-        } catch (const std::bad_alloc&) {  // what it left waits for the next time, and nobody for this one
-        }
-        done->set_value();
-      },
-      1);
-  return put == Put::taken && written.wait_until(deadline) == std::future_status::ready;
+  // What it leaves for want of memory waits for the next time, and nobody for this one.
+  return _queue.run([this] { write(); }, deadline);
 }
 
 std::optional<HistoryFolder::Removed> History::purge(std::chrono::steady_clock::time_point deadline) {
-  const auto done = std::make_shared<std::promise<std::optional<HistoryFolder::Removed>>>();
-  auto removed = done->get_future();
-  using Put = platform::DiskWriter::Queue::Put;
-  const auto put = _queue.put(
-      [this, done] {
-        std::optional<HistoryFolder::Removed> all;
-        try {
-          write();
-          all = _folder.purge();
-        } catch (const std::bad_alloc&) {
-        }
-        done->set_value(all);
-      },
-      1);
-  if (put != Put::taken || removed.wait_until(deadline) != std::future_status::ready) return std::nullopt;
-  return removed.get();
+  const auto removed = std::make_shared<std::optional<HistoryFolder::Removed>>();
+  const auto purge = [this, removed] {
+    write();
+    *removed = _folder.purge();
+  };
+  return _queue.run(purge, deadline) ? *removed : std::nullopt;
 }
 
 }  // namespace veltrad::support

@@ -35,10 +35,6 @@ std::string errorText(int error) {
   return std::strerror(error);
 }
 
-std::string textOfErrno() {
-  return errorText(errno);
-}
-
 void syncDirectory(const std::string& path) {
   const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (directory.isOpen()) ::fsync(directory.get());
@@ -182,12 +178,12 @@ Result<Done, std::string> HistoryFolder::appendTo(std::int64_t day, HistoryRecor
   const int flags = O_WRONLY | O_APPEND | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
   const FileDescriptor file(::open(path.c_str(), flags, 0600));
   struct stat before {};
-  if (!file.isOpen() || ::fstat(file.get(), &before) != 0) return Failure{path + ": " + textOfErrno()};
+  if (!file.isOpen() || ::fstat(file.get(), &before) != 0) return Failure{path + ": " + errorText(errno)};
   const int error = writeAndSync(file.get(), first, last);
   if (error != 0) {
     const bool shortened = ::ftruncate(file.get(), before.st_size) == 0;
     std::string why = path + ": " + errorText(error);
-    if (!shortened) why += ", nor shortened: " + textOfErrno();
+    if (!shortened) why += ", nor shortened: " + errorText(errno);
     return Failure{std::move(why)};
   }
   if (before.st_size == 0) syncDirectory(_directory);
@@ -235,7 +231,7 @@ void HistoryFolder::shorten(std::int64_t day, std::uint64_t bytes) {
                       ::fsync(copy.get()) == 0 && ::rename(fresh.c_str(), path.c_str()) == 0;
   if (copied) return syncDirectory(_directory);
   logError("The history could not be shortened, and its oldest day goes: %s: %s", path.c_str(),
-           textOfErrno().c_str());
+           errorText(errno).c_str());
   ::unlink(fresh.c_str());
   remove(day);
 }

@@ -77,6 +77,7 @@ std::optional<std::vector<SpoolFolder::Name>> SpoolFolder::names(double now) con
 void SpoolFolder::bringNamesBack(std::vector<Name>& names, double now) const {
   if (names.empty() || static_cast<double>(names.back().order) <= now * 1e6) return;
   std::vector<std::uint64_t> orders;
+  orders.reserve(names.size());
   for (const Name& name : names) orders.push_back(name.order);
   bringBack(orders, now);
   for (std::size_t i = 0; i < names.size(); ++i) {
@@ -93,10 +94,6 @@ Result<Done, std::string> SpoolFolder::write(const Name& name, std::string_view 
     written = _files.replace(pathOf(name), file, 0600);
   if (written) return Done();
   return Failure{std::move(written.error().description)};
-}
-
-bool SpoolFolder::rewrite(const Name& name, std::string_view file) const {
-  return _files.replace(pathOf(name), file, 0600).ok();
 }
 
 SpoolFolder::Read SpoolFolder::read(const Name& name) const {

@@ -53,8 +53,6 @@ class SpoolFolder {
   // Written new, synced, renamed, and the directory synced. On failure there is one line, and a file may be
   // left, which is whole.
   Result<Done, std::string> write(const Name& name, std::string_view file) const;
-  // The same for a file that is there, and stays as it is if that fails.
-  bool rewrite(const Name& name, std::string_view file) const;
   // What the file says of its order is what its name says.
   Read read(const Name& name) const;
   // False: it is still there.

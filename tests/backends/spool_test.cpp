@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // What the spool decides: which ends of a post keep it, which may still leave, and when an address is tried.
 #include <gtest/gtest.h>
+#include <malloc.h>
 
+#include "backends/https/spool_backlog.h"
 #include "backends/https/spool_verdicts.h"
 #include "backends/https/spool_waits.h"
 #include "config/owner_gate.h"
@@ -111,6 +113,26 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
       const std::string_view text = wire::entryOf(backends::countedFromSpool(*reason)).text;
       EXPECT_TRUE(text.ends_with(": " + std::string(wire::entryOf(*reason).name))) << text;
     }
+  }
+}
+
+// The list of a full spool takes 1.5 MiB.
+TEST(SpoolBacklog, GivesTheMemoryOfItsListBackOnceAllOfItIsReadOrTaken) {
+  const auto held = [] {
+    const auto of = ::mallinfo2();
+    return of.uordblks + of.hblkhd;
+  };
+  constexpr std::size_t kNames = 65'536, kBytes = kNames * sizeof(support::SpoolFolder::Name);
+  for (const bool reads : {true, false}) {
+    backends::SpoolBacklog backlog;
+    ASSERT_TRUE(backlog.isToBeListed());
+    const std::size_t before = held();
+    backlog.listed(std::vector<support::SpoolFolder::Name>(kNames));
+    if (held() < before + kBytes) GTEST_SKIP() << "a sanitizer's allocator tells nothing";
+    while (reads && backlog.next()) backlog.wasRead(true);
+    if (!reads) EXPECT_EQ(backlog.takeAll(std::chrono::steady_clock::now())->size(), kNames);
+    EXPECT_TRUE(backlog.isDone());
+    EXPECT_LT(held(), before + kBytes / 2) << reads;
   }
 }
 

@@ -60,13 +60,12 @@ TEST(Dictionary, keepsKeysInOrder) {
 
 TEST(Dictionary, sharesEntriesUntilOneOfItsCopiesChanges) {
   const Dictionary first{{"a", Dictionary{{"x", 1}}}, {"b", "a text that is too long for a string itself"}};
-  Dictionary set = first, erased = first, merged = first, taken = first, moved = first;
+  Dictionary set = first, erased = first, merged = first, taken = first;
   EXPECT_EQ(set.find("b"), first.find("b"));
   set.set("b", 2);
   erased.erase("a");
   merged.merge({{"a", 3}, {"c", 4}});
   EXPECT_EQ(taken.takeDictionary("a")->int32("x"), 1);
-  EXPECT_EQ(std::move(moved).takeEntries().size(), 2u);
   EXPECT_EQ(formats::writeJSON(first), R"({"a":{"x":1},"b":"a text that is too long for a string itself"})");
   EXPECT_EQ(set.int32("b"), 2);
   EXPECT_EQ(erased.size(), 1u);

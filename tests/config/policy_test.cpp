@@ -177,6 +177,33 @@ TEST(DailyAllowance, CountsADayAndKeepsItOverARestart) {
   }
 }
 
+TEST(DailyAllowance, GoesOnWithTheRecordOfADaemonThatWasKilled) {
+  FakeClock clock;
+  FakeFileStore files;
+  const std::int64_t today = clock.now().seconds / 86'400;
+  config::PolicyRules rules;
+  rules.dailyEvents = 9;
+  const auto file = [today](int events) {
+    return R"({"day": )" + std::to_string(today) + R"(, "events": )" + std::to_string(events) + "}";
+  };
+  const std::tuple<platform::DayAccount, std::string, std::uint64_t> rows[] = {
+      // what stands in the record, in the file, and what may still leave
+      {{today, 6, 1}, file(4), 3},
+      {{today, 6, 1}, "", 3},
+      {{today, 4, 1}, file(6), 3},
+      {{today - 1, 9, 1}, file(2), 7},
+      {{}, file(9), 0}};
+  for (auto [record, text, left] : rows) {
+    files.put("/daily", text);
+    config::DailyAllowance day(files, clock, "/daily");
+    day.countIn(record);
+    day.load();
+    EXPECT_FALSE(day.take(rules, left + 1, 0)) << text;
+    EXPECT_TRUE(day.take(rules, left, 0)) << text;
+    EXPECT_EQ(record.events, 9u) << text;  // where the next one finds it
+  }
+}
+
 TEST(Destinations, FitAFrameAndTheirFileWhateverStorebagsName) {
   FakeClock clock;
   FakeFileStore files;

@@ -143,7 +143,6 @@ class Configuration(SystemTest):
     @unittest.skipIf(os.getuid() != 0, "only root can be another user")
     def test_who_may(self):
         """Each row: what uid 65534 is granted, whether it may change and refresh."""
-        os.chmod(self.root.path, 0o755)
         with self.serving("FETCH", "fetch", "Fetch"):
             for granted, allowed in (({OBSERVE: True}, False), ({ENTITLEMENT: True}, False), ({CONTROL: True}, True)):
                 self.root.grant([{"uid": NOBODY, "entitlements": granted}])
@@ -151,7 +150,7 @@ class Configuration(SystemTest):
                               ("config", "unset", "environmentType"), ("refresh", "quindle")):
                     with self.subTest(granted=granted, words=words):
                         self.ctl("config", "set", "environmentType", "4")
-                        done = subprocess.run([program("veltractl"), *words], capture_output=True, text=True,
+                        done = subprocess.run([self.root.copy_of("veltractl"), *words], capture_output=True, text=True,
                                               env=self.root.environment(), user=NOBODY, timeout=DEADLINE)
                         self.assertEqual(done.returncode, 0 if allowed else 1, done.stderr)
                         self.assertEqual(CONTROL in done.stderr, not allowed)

@@ -99,19 +99,19 @@ class Control(SystemTest):
     @unittest.skipIf(os.getuid() != 0, "only root can be another user")
     def test_who_may_ask(self):
         """Each row: what uid 65534 is granted, whether status is answered."""
-        os.chmod(self.root.path, 0o755)
+        veltractl = self.root.copy_of("veltractl")
         with self.serving():
             for granted, answered in (({}, False), ({OBSERVE: True}, True), ({CONTROL: True}, True), ({OBSERVE: 1}, False),
                                       ({ENTITLEMENT: True}, False)):
                 with self.subTest(granted=granted):
                     self.root.grant([{"uid": NOBODY, "entitlements": granted}])
-                    done = subprocess.run([program("veltractl"), "status", "--json"], capture_output=True, text=True,
+                    done = subprocess.run([veltractl, "status", "--json"], capture_output=True, text=True,
                                           env=self.root.environment(), user=NOBODY, timeout=DEADLINE)
                     self.assertEqual(done.returncode, 0 if answered else 1, done.stderr)
                     if not answered:
                         self.assertIn(OBSERVE, done.stderr)
             self.root.grant([{"uid": NOBODY, "entitlements": {OBSERVE: True}}])
-            done = subprocess.run([program("veltractl"), "watch", "--contents"], capture_output=True, text=True,
+            done = subprocess.run([veltractl, "watch", "--contents"], capture_output=True, text=True,
                                   env=self.root.environment(), user=NOBODY, timeout=DEADLINE)
             self.assertEqual((done.returncode, CONTROL in done.stderr), (1, True), done.stderr)
 

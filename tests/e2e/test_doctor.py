@@ -22,7 +22,8 @@ LOGGED = ("fetchStorebag", "Entitlements", "storebagServerURL", "userDefaults", 
 class Doctor(SystemTest):
     def doctor(self, *arguments, **options):
         """The checks by name; the exit status, "ok" and the form are what they say."""
-        done = subprocess.run([program("veltractl"), "doctor", "--json", *arguments], capture_output=True, text=True,
+        veltractl = self.root.copy_of("veltractl") if "user" in options else program("veltractl")
+        done = subprocess.run([veltractl, "doctor", "--json", *arguments], capture_output=True, text=True,
                               env=self.root.environment(), timeout=DEADLINE, **options)
         answer = json.loads(done.stdout)
         self.assertEqual([check["name"] for check in answer["checks"]], NAMES)
@@ -168,7 +169,6 @@ class Doctor(SystemTest):
     @unittest.skipIf(os.getuid() != 0, "only root can be another user")
     def test_who_may_not_ask(self):
         """Each row: what uid 65534 is granted, what it is told of itself."""
-        os.chmod(self.root.path, 0o755)
         with self.serving(*LOGGED):
             for granted, result in (({}, "failure"), ({ENTITLEMENT: True}, "ok")):
                 self.root.grant([{"uid": NOBODY, "entitlements": granted}])

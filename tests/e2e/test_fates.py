@@ -304,7 +304,7 @@ class RandomFates(FatesTest):
 
     def play(self, world, messages):
         energy = self.root.path / "var/log/veltrad/energy.jsonl"
-        for path in (energy, self.root.path / "var/lib/veltrad/daily.json"):
+        for path in (energy, self.root.path / "var/lib/veltrad/daily.json", self.root.path / "run/veltrad/counts"):
             path.unlink(missing_ok=True)
         for name in ("quindle", "ostvane"):
             self.lab.put(name, world.storebag())

@@ -183,6 +183,19 @@ class Owner(OwnerTest):
             self.assertEqual((removed["records"], removed["days"]), (len(items) + 1, 1))
             self.assertEqual((self.history(), list((self.root.path / HISTORY).iterdir())), ([], []))
 
+    def test_a_days_limit_holds_over_kills(self):
+        self.say(dailyEvents=6)  # each message: a post and a datagram
+        for number in range(4):
+            (self.root.path / "var/lib/veltrad/daily.json").unlink(missing_ok=True)  # the kill came before it was written
+            daemon = self.daemon()
+            client = self.client()
+            for _ in range(4):
+                client.message(number=number)
+            daemon.wait_for_line(REFUSED + " (over_daily_limit)")
+            wait_until(lambda: sum(self.arrived()[:2]) >= 6, "what may leave", also=self.arrived)
+            daemon.kill()
+        self.assertEqual(sum(self.arrived()[:2]), 6)
+
     def test_history_survives_kills_whole(self, rounds=int(os.environ.get("VELTRA_ROUNDS", "5"))):
         self.say(history={})
         synced = {}  # some of what was listed, and so is on disk, with its body

@@ -5,6 +5,7 @@
 #include <gtest/gtest.h>
 
 #include <optional>
+#include <tuple>
 
 #include "fakes/temporary_directory.h"
 #include "platform/file_store.h"
@@ -38,6 +39,8 @@ TEST(CountsRecord, WhatAKilledProcessHadNotSettledOrToldIsCountedOnce) {
   {
     Life life(directory);
     EXPECT_EQ(life.lostBefore(), 0u);
+    EXPECT_EQ(life.record.value().counts().day.events, 0u);
+    life.record.value().counts().day = {20'000, 7, 70};
     for (int i = 0; i < 10; ++i) life.counters.eventTaken();
     life.counters.count(Reason::event_batched, 10);
     life.counters.count(Reason::post_failed);
@@ -53,6 +56,8 @@ TEST(CountsRecord, WhatAKilledProcessHadNotSettledOrToldIsCountedOnce) {
   EXPECT_EQ(Life(directory).lostBefore(), 11u);
   {
     Life life(directory);  // the one before had told nobody
+    const DayAccount& day = life.record.value().counts().day;
+    EXPECT_EQ(std::tuple(day.day, day.events, day.bytes), std::tuple(20'000, 7u, 70u));
     EXPECT_EQ(life.lostBefore(), 11u);
     life.counters.eventTaken();
     life.writeCounters();

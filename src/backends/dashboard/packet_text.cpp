@@ -4,26 +4,42 @@
 
 #include <algorithm>
 #include <cstring>
+#include <iterator>
+#include <string>
 #include <vector>
-
-#include "backends/dashboard/value_description.h"
 
 namespace veltrad::backends {
 
 namespace {
 struct Item {
   const std::string* key;
-  ValueDescription value;
+  const std::string* held;  // the value's own text; null: `made`
+  std::string made;
+  std::size_t characters;
+
+  std::string_view text() const { return held ? *held : made; }
 };
+
+std::size_t charactersOf(std::string_view text) {
+  const auto beginsCharacter = [](char c) { return (static_cast<unsigned char>(c) & 0xC0) != 0x80; };
+  return static_cast<std::size_t>(std::count_if(text.begin(), text.end(), beginsCharacter));
+}
+
+// Texts unchanged, numbers in decimal (reals as short as reads back the same), booleans as 1 and 0, anything
+// else as "null".
+Item itemOf(const Dictionary::Entry& entry) {
+  Item item{&entry.first, entry.second.asString(), {}, 0};
+  if (!item.held) item.made = entry.second.toText().value_or("null");
+  item.characters = charactersOf(item.text());
+  return item;
+}
 
 std::vector<Item> itemsInOrder(const Dictionary& payload) {
   std::vector<Item> items;
   items.reserve(payload.size());
-  for (const auto& [key, value] : payload) items.push_back({&key, descriptionForObject(value)});
+  std::transform(payload.begin(), payload.end(), std::back_inserter(items), itemOf);
   std::sort(items.begin(), items.end(), [](const Item& a, const Item& b) {
-    const std::size_t lengthA = a.value.characters();
-    const std::size_t lengthB = b.value.characters();
-    return lengthA != lengthB ? lengthA < lengthB : *a.key < *b.key;
+    return a.characters != b.characters ? a.characters < b.characters : *a.key < *b.key;
   });
   return items;
 }
@@ -43,7 +59,7 @@ void PacketText::append(const Dictionary& payload) {
     put(" ");
     put(untilNUL(*item.key));
     put("=");
-    sanitize(item.value.text());
+    sanitize(item.text());
     if (_cut) return;
   }
 }

@@ -38,7 +38,6 @@ class EventBatch {
   static constexpr std::size_t kMostBytes = 4u << 20;
 
   std::size_t size() const { return _events.size(); }
-  std::size_t jsonBytes() const { return _bytes.json; }
   std::size_t chargedBytes() const { return _bytes.charged; }
   // The turn with which the oldest event was added.
   std::optional<std::uint64_t> oldestTurn() const;

@@ -69,6 +69,12 @@ void takeForSpool(const std::shared_ptr<SpooledPost>& post, const SessionFacts& 
   request.isKept = true;
 }
 
+wire::StepEntry entryOf(std::uint64_t post) {
+  wire::StepEntry entry;
+  entry.post = post;
+  return entry;
+}
+
 void logPostError(const std::optional<std::string>& text) {
   if (text) logError("HTTPSPostBackend(postJsonMessage): post error: %s", text->c_str());
 }
@@ -119,8 +125,7 @@ std::optional<wire::Decision> EventPosts::postJSONMessage(const std::shared_ptr<
   const auto answered = [this, backEnd, number, postedTo = *url, eventCount = post.eventCount,
                          completion = std::move(post.completion)](const http::HTTPResult& result) {
     backEnd->postEnded(result ? fmt::format("HTTP {}", result.value().status) : result.error().description);
-    noteEnd(*backEnd, result, number);
-    auto error = handleAnswer(*backEnd, result, postedTo, eventCount);
+    auto error = handleAnswer(*backEnd, result, postedTo, eventCount, entryOf(number));
     if (completion) completion(std::nullopt, std::move(error));
   };
   if (const auto started = _http.start(std::move(request), answered); !started) {
@@ -169,8 +174,7 @@ void EventPosts::endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<Spool
   backEnd.postEnded(outcomeOf(result));
   std::optional<wire::ReportingError> error;
   if (!isToBeKept(result)) {
-    noteEnd(backEnd, result, post->fate);
-    error = handleAnswer(backEnd, result, post->entry.url, post->entry.events);
+    error = handleAnswer(backEnd, result, post->entry.url, post->entry.events, entryOf(post->fate));
   } else if (result) {
     const int status = result.value().status;
     error =
@@ -199,19 +203,6 @@ std::uint64_t EventPosts::notePost(const VeltraBackend& backEnd, const http::HTT
   return fate.post;
 }
 
-void EventPosts::noteEnd(const VeltraBackend& backEnd, const http::HTTPResult& result, std::uint64_t post) {
-  wire::StepEntry fate;
-  fate.post = post;
-  const int status = result ? result.value().status : result.error().status;
-  const PostVerdict verdict = verdictOfStatus(status);
-  if (result || verdict.disablesBackend) {
-    fate.status = static_cast<std::uint16_t>(status);
-    return backEnd.pen().write(wire::Step::answered, verdict.reason, fate);
-  }
-  const http::HTTPError& error = result.error();
-  backEnd.pen().write(error.mayHaveArrived() ? wire::Step::lost : wire::Step::dropped, reasonOf(error), fate);
-}
-
 int EventPosts::compressionLevel() {
   const auto choices = _choices.current();
   return (choices ? *choices : config::OperatorChoices()).compression.level;
@@ -221,15 +212,15 @@ wire::Reason EventPosts::refusePost(VeltraBackend& backEnd, std::size_t eventCou
                                     const VeltraBackend::FlushCompletion& completion,
                                     const wire::StepEntry& fate) {
   const http::HTTPError refusal{http::HTTPError::Kind::tooMany, "Too many posts under way"};
-  backEnd.pen().write(wire::Step::dropped, wire::Reason::too_many_posts, fate);
-  auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount);
+  auto error = handleAnswer(backEnd, Failure{refusal}, {}, eventCount, fate);
   if (completion) completion(std::nullopt, std::move(error));
   return wire::Reason::too_many_posts;
 }
 
 std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& backEnd,
                                                              const http::HTTPResult& result,
-                                                             const std::string& url, std::size_t eventCount) {
+                                                             const std::string& url, std::size_t eventCount,
+                                                             wire::StepEntry fate) {
   std::optional<wire::ReportingError> error;
   if (!result.ok()) {
     const std::string& description = result.error().description;
@@ -240,7 +231,13 @@ std::optional<wire::ReportingError> EventPosts::handleAnswer(VeltraBackend& back
   const int status = result.ok() ? result.value().status : result.error().status;
   const PostVerdict verdict = verdictOfStatus(status);
   const bool answered = result.ok() || verdict.disablesBackend;
-  _counters.count(answered ? verdict.reason : reasonOf(result.error()), eventCount);
+  const wire::Reason reason = answered ? verdict.reason : reasonOf(result.error());
+  if (answered) fate.status = static_cast<std::uint16_t>(status);
+  backEnd.pen().write(answered                          ? wire::Step::answered
+                      : result.error().mayHaveArrived() ? wire::Step::lost
+                                                        : wire::Step::dropped,
+                      reason, fate);
+  _counters.count(reason, eventCount);
   if (!verdict.disablesBackend) return error;
   const std::string text =
       fmt::sprintf("backend %s disabled by server %d return code", backEnd.name(), status);

@@ -67,7 +67,6 @@ class EventPosts {
  private:
   static std::uint64_t notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
                                 wire::StepEntry fate);
-  static void noteEnd(const VeltraBackend& backEnd, const http::HTTPResult& result, std::uint64_t post);
   std::optional<wire::Decision> postOrKeep(const std::shared_ptr<VeltraBackend>& backEnd,
                                            const SessionFacts& facts, http::HTTPRequest request,
                                            const wire::StepEntry& fate,
@@ -76,8 +75,10 @@ class EventPosts {
   void endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<SpooledPost>& post,
                    const VeltraBackend::FlushCompletion& completion, const http::HTTPResult& result);
   int compressionLevel();
+  // Writes and counts what has become of the events. `fate` names them in the record.
   std::optional<wire::ReportingError> handleAnswer(VeltraBackend& backEnd, const http::HTTPResult& result,
-                                                   const std::string& url, std::size_t eventCount);
+                                                   const std::string& url, std::size_t eventCount,
+                                                   wire::StepEntry fate);
 
   http::HTTPClient& _http;
   const platform::Clock& _clock;

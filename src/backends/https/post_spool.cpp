@@ -5,7 +5,6 @@
 #include <time.h>
 
 #include <algorithm>
-#include <future>
 #include <new>
 #include <utility>
 
@@ -38,10 +37,6 @@ double runningSeconds() {
   timespec time{};
   ::clock_gettime(CLOCK_BOOTTIME, &time);
   return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
-}
-
-NotedPost notedPost(const support::SpoolPlace& place) {
-  return {place.backend, place.fate};
 }
 
 support::SpoolPlace placeOf(const support::SpoolEntry& entry, std::uint64_t fate) {
@@ -92,7 +87,7 @@ void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTP
   if (isToBeKept(result)) {
     entry.lastError = outcomeOf(result);
     if (tellsOfServer(result)) _queue.failed(address, result);
-    return file(post);
+    return keep(post);
   }
   if (entry.tries > 0) _notes.record(entry, entry.tries, endOf(result));
   _queue.landed(entry.order, address, result.ok());
@@ -101,21 +96,18 @@ void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTP
 }
 
 void PostSpool::keep(const std::shared_ptr<SpooledPost>& post) {
-  file(post);
-}
-
-void PostSpool::file(const std::shared_ptr<SpooledPost>& post) {
   const support::SpoolEntry& entry = post->entry;
   if (!_queue.add(placeOf(entry, post->fate), http::addressOf(entry.url), entry.uid, post->emptied)) {
     _counters.count(Reason::spool_refused_by_owner, entry.events);
-    _notes.dropped(notedPost(placeOf(entry, post->fate)), Reason::refused_by_owner);
+    _notes.dropped(placeOf(entry, post->fate), Reason::refused_by_owner);
     return recordUnsent(entry, entry.tries);
   }
   using Put = platform::DiskWriter::Queue::Put;
   const std::size_t bytes = entry.body.size() + entry.url.size();
   const auto job = [this, post] {
     try {
-      write(*post);
+      // Whoever has dropped it meanwhile had no copy of it to record.
+      if (!keepOnDisk(post->entry)) recordUnsent(post->entry, post->entry.tries);
     } catch (const std::bad_alloc&) {
       drop({post->entry.order, post->entry.id}, Reason::spool_disk, &post->entry);
     }
@@ -123,14 +115,8 @@ void PostSpool::file(const std::shared_ptr<SpooledPost>& post) {
   if (_jobs.put(job, bytes) != Put::taken) drop({entry.order, entry.id}, Reason::spool_disk, &entry);
 }
 
-// On the disk writer's thread. Whoever has dropped it meanwhile had no copy of it to record.
-void PostSpool::write(const SpooledPost& post) {
-  if (!keepOnDisk(post)) recordUnsent(post.entry, post.entry.tries);
-}
-
-// False: somebody else has dropped it.
-bool PostSpool::keepOnDisk(const SpooledPost& post) {
-  const support::SpoolEntry& entry = post.entry;
+// On the disk writer's thread. False: somebody else has dropped it.
+bool PostSpool::keepOnDisk(const support::SpoolEntry& entry) {
   const Name name{entry.order, entry.id};
   if (const auto refused = verdict(entry, _rules.facts()).refusal) return drop(name, *refused, &entry);
   const std::string bytes = support::writeSpoolEntry(entry);
@@ -144,14 +130,13 @@ bool PostSpool::keepOnDisk(const SpooledPost& post) {
     _removals.remove(name);  // it may be there, and its name not on disk
     return dropped;
   }
-  if (!_queue.written(name.order)) {
+  const auto place = _queue.written(name.order);
+  if (!place) {
     _removals.remove(name);
     return false;
   }
   _counters.count(Reason::kept_in_spool, entry.events);
-  SpoolQueue::AddressStatus address;
-  const auto place = _queue.place(name.order, address);
-  if (place) _notes.kept(notedPost(*place), entry.lastError, _queue.waitAt(place->address));
+  _notes.kept(*place, entry.lastError, _queue.waitAt(place->address));
   wake();
   return true;
 }
@@ -173,7 +158,7 @@ bool PostSpool::drop(const Name& name, Reason reason, const support::SpoolEntry*
   // What was kept has been settled before.
   if (onDisk) _counters.eventTaken(place->events);
   _counters.count(countedFromSpool(reason), place->events);
-  _notes.dropped(notedPost(*place), reason);
+  _notes.dropped(*place, reason);
   // Whoever writes or sends it has a copy, and records it.
   const bool records = place->tries > 0 && _notes.keepsRecords() &&
                        (place->state == State::waiting || (place->state == State::writing && post));
@@ -225,11 +210,7 @@ std::size_t PostSpool::sendNow() {
 }
 
 bool PostSpool::drain(Deadline deadline) {
-  const auto done = std::make_shared<std::promise<void>>();
-  auto written = done->get_future();
-  using Put = platform::DiskWriter::Queue::Put;
-  return _jobs.put([done] { done->set_value(); }, 1) == Put::taken &&
-         written.wait_until(deadline) == std::future_status::ready;
+  return _jobs.run([] {}, deadline);
 }
 
 // By the disk writer, so that nothing is written meanwhile.
@@ -319,8 +300,7 @@ LeaveVerdict PostSpool::verdictBeforeTry(const support::SpoolEntry& post,
 }
 
 void PostSpool::begins(const Name& name) {
-  SpoolQueue::AddressStatus address;
-  if (const auto place = _queue.place(name.order, address)) _notes.again(notedPost(*place));
+  if (const auto place = _queue.place(name.order)) _notes.again(*place);
 }
 
 // A post that has arrived and whose file outlives a kill comes again with the same ID.
@@ -335,7 +315,7 @@ void PostSpool::tried(const support::SpoolEntry& post, const http::HTTPResult& r
     return;
   }
   if (!result || isToBeKept(result)) {
-    _notes.kept(notedPost(*place), outcomeOf(result), _queue.waitAt(place->address));
+    _notes.kept(*place, outcomeOf(result), _queue.waitAt(place->address));
     return writeAgain(post);
   }
   const int status = result.value().status;
@@ -343,20 +323,19 @@ void PostSpool::tried(const support::SpoolEntry& post, const http::HTTPResult& r
   _counters.eventTaken(post.events);
   _counters.count(reason, post.events);
   _removals.remove(name);
-  _notes.answered(notedPost(*place), reason, status);
+  _notes.answered(*place, reason, status);
   _notes.record(post, tries, endOf(result));
 }
 
 // With the number of its tries.
 void PostSpool::writeAgain(const support::SpoolEntry& post) {
   const Name name{post.order, post.id};
-  SpoolQueue::AddressStatus address;
-  if (const auto place = _queue.place(post.order, address)) {
+  if (const auto place = _queue.place(post.order)) {
     support::SpoolEntry now = post;
     now.tries = place->tries;
-    now.lastError = address.lastError;
+    now.lastError = _queue.statusAt(place->address).lastError;
     const std::string bytes = support::writeSpoolEntry(now);
-    if (_folder.rewrite(name, bytes)) _queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()));
+    if (_folder.write(name, bytes)) _queue.setBytes(name.order, static_cast<std::uint32_t>(bytes.size()));
   }
   // It may have been dropped meanwhile.
   if (!_queue.holds(post.order)) _removals.remove(name);

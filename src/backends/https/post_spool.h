@@ -77,7 +77,7 @@ class PostSpool {
   std::optional<std::string> admit(SpooledPost& post);
   // If it has ended so that it is kept, that is done soon.
   void ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result);
-  // A post that was not admitted.
+  // Keeps a post that was not admitted.
   void keep(const std::shared_ptr<SpooledPost>& post);
 
   // The sender's thread, where nothing else is said.
@@ -127,9 +127,7 @@ class PostSpool {
   void wake();
   void dropUnlisted(std::optional<wire::Reason> why);
   std::optional<wire::Reason> whyUnlisted();
-  void file(const std::shared_ptr<SpooledPost>& post);
-  void write(const SpooledPost& post);
-  bool keepOnDisk(const SpooledPost& post);
+  bool keepOnDisk(const support::SpoolEntry& entry);
   void makeRoom();
   void load(const Name& name, const Each& each);
   void dropUnread(const Name& name, wire::Reason reason);

@@ -9,7 +9,7 @@
 #include "config/owner_gate.h"
 #include "http/header_lines.h"
 #include "platform/fate_pen.h"
-#include "support/spool_entry.h"
+#include "support/spool_index.h"
 
 namespace veltrad::backends {
 
@@ -31,23 +31,25 @@ void SpoolNotes::record(const support::SpoolEntry& post, int transmissions, http
   _gate.ended(_gate.record(departure, std::move(lines), post.body, nullptr), end);
 }
 
-void SpoolNotes::note(wire::Step step, const NotedPost& post, std::optional<wire::Reason> reason,
-                      int status) const {
-  if (post.number == 0) return;
-  wire::StepEntry entry;
-  entry.post = post.number;
-  entry.status = static_cast<std::uint16_t>(status);
+void SpoolNotes::note(wire::Step step, const support::SpoolPlace& post, std::optional<wire::Reason> reason,
+                      wire::StepEntry entry) const {
+  if (post.fate == 0) return;
+  entry.post = post.fate;
   platform::FatePen(_fates, wire::kBackendNames[post.backend]).write(step, reason, entry);
 }
 
-void SpoolNotes::kept(const NotedPost& post, const std::string& error, double wait) const {
-  if (post.number == 0) return;
-  const platform::FatePen pen(_fates, wire::kBackendNames[post.backend]);
+void SpoolNotes::answered(const support::SpoolPlace& post, wire::Reason reason, int status) const {
   wire::StepEntry entry;
-  entry.post = post.number;
-  entry.text = pen.textOf(error);
+  entry.status = static_cast<std::uint16_t>(status);
+  note(wire::Step::answered, post, reason, entry);
+}
+
+void SpoolNotes::kept(const support::SpoolPlace& post, const std::string& error, double wait) const {
+  if (post.fate == 0) return;
+  wire::StepEntry entry;
+  entry.text = platform::FatePen(_fates, {}).textOf(error);
   entry.bytes = static_cast<std::uint32_t>(wait);
-  pen.write(wire::Step::kept, wire::Reason::kept_in_spool, entry);
+  note(wire::Step::kept, post, wire::Reason::kept_in_spool, entry);
 }
 
 }  // namespace veltrad::backends

@@ -2,12 +2,11 @@
 // What the history of what left and the record of fates are told of posts in the spool. Any thread.
 #pragma once
 
-#include <cstdint>
 #include <optional>
 #include <string>
 
 #include "http/request_gate.h"
-#include "wire/fates.h"
+#include "wire/fate_entries.h"
 
 namespace veltrad::config {
 class OwnerGate;
@@ -19,15 +18,10 @@ class FateRing;
 
 namespace veltrad::support {
 struct SpoolEntry;
+struct SpoolPlace;
 }  // namespace veltrad::support
 
 namespace veltrad::backends {
-
-// A post in the record of fates. Number 0: it is not there.
-struct NotedPost {
-  std::uint8_t backend = 0;
-  std::uint64_t number = 0;
-};
 
 class SpoolNotes {
  public:
@@ -38,18 +32,18 @@ class SpoolNotes {
   // A post that was sent so often has ended, for good. One record for all of it.
   void record(const support::SpoolEntry& post, int transmissions, http::DepartureEnd end) const;
 
-  void dropped(const NotedPost& post, wire::Reason reason) const {
-    note(wire::Step::dropped, post, reason, 0);
+  // One that the record of fates does not know is passed over.
+  void dropped(const support::SpoolPlace& post, wire::Reason reason) const {
+    note(wire::Step::dropped, post, reason, {});
   }
-  void again(const NotedPost& post) const { note(wire::Step::again, post, std::nullopt, 0); }
-  void answered(const NotedPost& post, wire::Reason reason, int status) const {
-    note(wire::Step::answered, post, reason, status);
-  }
+  void again(const support::SpoolPlace& post) const { note(wire::Step::again, post, std::nullopt, {}); }
+  void answered(const support::SpoolPlace& post, wire::Reason reason, int status) const;
   // `wait`: in seconds, until its address is tried again.
-  void kept(const NotedPost& post, const std::string& error, double wait) const;
+  void kept(const support::SpoolPlace& post, const std::string& error, double wait) const;
 
  private:
-  void note(wire::Step step, const NotedPost& post, std::optional<wire::Reason> reason, int status) const;
+  void note(wire::Step step, const support::SpoolPlace& post, std::optional<wire::Reason> reason,
+            wire::StepEntry entry) const;
 
   config::OwnerGate& _gate;
   platform::FateRing* const _fates;

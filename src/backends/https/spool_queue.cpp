@@ -154,11 +154,12 @@ bool SpoolQueue::setBytes(std::uint64_t order, std::uint32_t bytes) {
   return place != nullptr;
 }
 
-bool SpoolQueue::written(std::uint64_t order) {
+std::optional<SpoolQueue::Place> SpoolQueue::written(std::uint64_t order) {
   const Lock held(_mutex);
   Place* place = _index.find(order);
-  if (place) place->state = State::waiting;
-  return place != nullptr;
+  if (!place) return std::nullopt;
+  place->state = State::waiting;
+  return *place;
 }
 
 bool SpoolQueue::holds(std::uint64_t order) const {
@@ -310,19 +311,23 @@ SpoolQueue::AddressStatus SpoolQueue::statusOf(std::uint16_t address) const {
 std::vector<SpoolQueue::AddressStatus> SpoolQueue::addresses() const {
   std::vector<AddressStatus> all;
   const Lock held(_mutex);
-  for (std::uint16_t address = 0; address < _waits.size(); ++address) {
+  for (std::size_t i = 0; i < _waits.size(); ++i) {
+    const auto address = static_cast<std::uint16_t>(i);
     if (_index.postsAt(address) > 0 && _index.address(address) != kNoAddress)
       all.push_back(statusOf(address));
   }
   return all;
 }
 
-std::optional<SpoolQueue::Place> SpoolQueue::place(std::uint64_t order, AddressStatus& address) const {
+std::optional<SpoolQueue::Place> SpoolQueue::place(std::uint64_t order) const {
   const Lock held(_mutex);
   const Place* found = _index.find(order);
-  if (!found) return std::nullopt;
-  address = statusOf(found->address);
-  return *found;
+  return found ? std::optional(*found) : std::nullopt;
+}
+
+SpoolQueue::AddressStatus SpoolQueue::statusAt(std::uint16_t address) const {
+  const Lock held(_mutex);
+  return statusOf(address);
 }
 
 double SpoolQueue::waitAt(std::uint16_t address) const {

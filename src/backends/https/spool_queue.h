@@ -67,8 +67,8 @@ class SpoolQueue {
 
   // The size of its file is known. False: it is not there any more.
   bool setBytes(std::uint64_t order, std::uint32_t bytes);
-  // It is on disk.
-  bool written(std::uint64_t order);
+  // It is on disk. Returns it as it is now; nothing: it is not there any more.
+  std::optional<Place> written(std::uint64_t order);
   bool holds(std::uint64_t order) const;
   // As it was; nothing: it is not there.
   std::optional<Place> takeOut(std::uint64_t order);
@@ -98,7 +98,9 @@ class SpoolQueue {
   // So many after this order, without those that are being written.
   std::vector<Name> names(std::uint64_t after, std::size_t most) const;
   std::optional<Name> named(const support::PostID& id) const;
-  std::optional<Place> place(std::uint64_t order, AddressStatus& address) const;
+  std::optional<Place> place(std::uint64_t order) const;
+  // By the number in a place.
+  AddressStatus statusAt(std::uint16_t address) const;
   std::vector<AddressStatus> addresses() const;
 
   // In seconds from now.

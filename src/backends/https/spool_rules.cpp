@@ -4,12 +4,10 @@
 
 #include <utility>
 
-#include "config/owner_gate.h"
 #include "config/preference_keys.h"
 #include "platform/locale.h"
 #include "platform/preferences.h"
 #include "support/device_identity.h"
-#include "support/spool_entry.h"
 
 namespace veltrad::backends {
 
@@ -26,19 +24,6 @@ std::optional<ClientFacts> SpoolRules::facts() const {
   if (!given || !device) return std::nullopt;
   return ClientFacts{*given, _sources.locale.countryCode(), std::move(device->name).value_or(""),
                      std::move(device->productType), 0};
-}
-
-LeaveVerdict SpoolRules::verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
-                                 const std::optional<ClientFacts>& facts) const {
-  return verdictOnLeaving(post, *_sources.gate.word(), section, facts);
-}
-
-std::optional<wire::Reason> SpoolRules::ownersRefusal(const support::SpoolEntry& post) const {
-  return refusalByOwner(post, *_sources.gate.word());
-}
-
-std::optional<wire::Reason> SpoolRules::refusalOfAll() const {
-  return _sources.gate.word()->refusal;
 }
 
 SpoolRules::Word SpoolRules::word(const Word& before) const {

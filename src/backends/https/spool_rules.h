@@ -7,12 +7,9 @@
 #include <optional>
 
 #include "backends/https/spool_verdicts.h"
+#include "config/owner_gate.h"
 #include "config/storebag_content.h"
 #include "wire/reasons.h"
-
-namespace veltrad::config {
-class OwnerGate;
-}  // namespace veltrad::config
 
 namespace veltrad::platform {
 class Locale;
@@ -41,10 +38,14 @@ class SpoolRules {
   std::optional<ClientFacts> facts() const;
   // As in spool_verdicts.h, by the owner's word of now.
   LeaveVerdict verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
-                       const std::optional<ClientFacts>& facts) const;
-  std::optional<wire::Reason> ownersRefusal(const support::SpoolEntry& post) const;
+                       const std::optional<ClientFacts>& facts) const {
+    return verdictOnLeaving(post, *_sources.gate.word(), section, facts);
+  }
+  std::optional<wire::Reason> ownersRefusal(const support::SpoolEntry& post) const {
+    return refusalByOwner(post, *_sources.gate.word());
+  }
   // Why nothing may leave.
-  std::optional<wire::Reason> refusalOfAll() const;
+  std::optional<wire::Reason> refusalOfAll() const { return _sources.gate.word()->refusal; }
 
   // What the owner says; changes with the policy and the consent. A shortage is no change.
   struct Word {

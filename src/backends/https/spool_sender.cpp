@@ -187,8 +187,7 @@ void SpoolSender::begin(const PostSpool::Name& name) {
   SpoolQueue& queue = _spool.queue();
   support::SpoolFolder::Read found = _spool.read(name);
   if (found.passes) return queue.putBack(name.order, kUntilDecided);
-  SpoolQueue::AddressStatus address;
-  const auto place = queue.place(name.order, address);
+  const auto place = queue.place(name.order);
   if (!place) return;
   if (!found.entry) {
     _spool.drop(name, wire::Reason::spool_disk);

@@ -31,7 +31,7 @@ const char* textOf(Severity severity) {
 std::span<const FindingKind> findingKinds() {
   static const FindingKind kKinds[] = {
 #define VELTRA_FINDING(name, severity, meaning, mend) \
-  {FindingName::name, shown(#name), Severity::severity, meaning, mend},
+  {FindingName::name, Severity::severity, shown(#name), meaning, mend},
 #include "storebag/findings.def"
 #undef VELTRA_FINDING
   };

@@ -23,9 +23,9 @@ const char* textOf(Severity severity);
 
 struct FindingKind {
   FindingName id;
+  Severity severity;
   // As users see it: "unknown-key".
   std::string name;
-  Severity severity;
   const char* meaning;
   const char* mend;
 };
