@@ -12,7 +12,7 @@
 
 namespace veltrad::gateway {
 
-// What no column takes is refused at the door. In bytes.
+// What no column takes is refused at the router. In bytes.
 inline constexpr std::size_t kMostIdentifierBytes = 1'024;
 inline constexpr std::size_t kMostKeyBytes = 256;
 

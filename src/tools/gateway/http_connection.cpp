@@ -77,7 +77,7 @@ void HTTPConnection::readHead() {
   _state = State::idle;
   _parser.emplace();
   _parser->header_limit(static_cast<std::uint32_t>(_owner.bounds.headerBytes));
-  // Who takes the body counts its bytes.
+  // The handler counts the body's bytes.
   _parser->body_limit(std::numeric_limits<std::uint64_t>::max());
   _stream.expires_after(_owner.bounds.idle);
   http::async_read_header(_stream, _buffer, *_parser, then(&HTTPConnection::headRead));
@@ -90,9 +90,9 @@ void HTTPConnection::headRead(const Error& error, std::size_t) {
   auto handled =
       _owner.handler(Head(_parser->get(), length ? std::optional<std::uint64_t>(*length) : std::nullopt));
   if (auto* refusal = std::get_if<Answer>(&handled)) return answer(std::move(*refusal), !_parser->is_done());
-  _taker = std::move(std::get<std::unique_ptr<BodyTaker>>(handled));
+  _bodyHandler = std::move(std::get<std::unique_ptr<BodyHandler>>(handled));
   if (_parser->is_done()) return finish();
-  _parser->get().body().taker = _taker.get();
+  _parser->get().body().handler = _bodyHandler.get();
   _pace = BodyPace(_owner.bounds.stalled);
   _buffer.reserve(kReadBytes);
   continueThenRead();
@@ -122,7 +122,7 @@ void HTTPConnection::goOn(const Error& error, std::size_t) {
 
 void HTTPConnection::readBody() {
   if (_parser->is_done()) return finish();
-  if (!_taker->hasRoom(later(&HTTPConnection::goOn))) return _stream.expires_never();
+  if (!_bodyHandler->hasRoom(later(&HTTPConnection::goOn))) return _stream.expires_never();
   _waitsSince = std::chrono::steady_clock::now();
   _stream.expires_after(_pace.left());
   http::async_read_some(_stream, _buffer, *_parser, then(&HTTPConnection::bodyRead));
@@ -140,11 +140,11 @@ void HTTPConnection::bodyRead(const Error& error, std::size_t count) {
 void HTTPConnection::finish() {
   _buffer.shrink_to_fit();
   _stream.expires_never();
-  _taker->finish(later(&HTTPConnection::finished));
+  _bodyHandler->finish(later(&HTTPConnection::finished));
 }
 
 void HTTPConnection::finished(const Error&, std::size_t) {
-  answer(_taker->answer(), false);
+  answer(_bodyHandler->answer(), false);
 }
 
 void HTTPConnection::answer(Answer made, bool closes) {
@@ -165,7 +165,7 @@ void HTTPConnection::answer(Answer made, bool closes) {
 void HTTPConnection::answered(const Error& error, std::size_t) {
   const bool whole = _parser->is_done(), closes = !_response->keep_alive();
   _response.reset();
-  _taker.reset();
+  _bodyHandler.reset();
   if (error) return;
   if (!closes) {
     _buffer.shrink_to_fit();

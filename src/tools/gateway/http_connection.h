@@ -19,10 +19,10 @@
 
 namespace veltrad::gateway {
 
-// A body as Beast sees it: its bytes go to who takes them, and none are kept.
-struct TakenBody {
+// A body as Beast sees it: its bytes go to the handler, and none are kept.
+struct ForwardedBody {
   struct value_type {
-    BodyTaker* taker = nullptr;
+    BodyHandler* handler = nullptr;
     std::optional<Answer> refusal = std::nullopt;
   };
 
@@ -32,10 +32,10 @@ struct TakenBody {
     reader(boost::beast::http::header<isRequest, Fields>&, value_type& body) : _body(body) {}
 
     void init(const boost::optional<std::uint64_t>&, boost::system::error_code& error) { error = {}; }
-    // What the taker leaves stays in the connection's buffer for its next turn.
+    // What the handler leaves stays in the connection's buffer for its next turn.
     std::size_t put(const boost::asio::const_buffer& given, boost::system::error_code& error) {
       std::string_view bytes(static_cast<const char*>(given.data()), given.size());
-      _body.refusal = _body.taker->take(bytes);
+      _body.refusal = _body.handler->take(bytes);
       if (_body.refusal) bytes = {};
       error = {};
       if (!bytes.empty()) error = boost::beast::http::error::need_buffer;
@@ -82,7 +82,7 @@ class HTTPConnection : public std::enable_shared_from_this<HTTPConnection> {
 
  private:
   using Error = boost::system::error_code;
-  using Parser = boost::beast::http::request_parser<TakenBody>;
+  using Parser = boost::beast::http::request_parser<ForwardedBody>;
   using Response = boost::beast::http::response<boost::beast::http::string_body>;
   using Step = void (HTTPConnection::*)(const Error& error, std::size_t count);
   enum class State { idle, owesAnswer, answers };
@@ -119,7 +119,7 @@ class HTTPConnection : public std::enable_shared_from_this<HTTPConnection> {
   // What was read and not yet parsed: at most a header, a chunk's line, or a piece of a body.
   boost::beast::flat_buffer _buffer{std::size_t{64} << 10};
   std::optional<Parser> _parser;
-  std::unique_ptr<BodyTaker> _taker;
+  std::unique_ptr<BodyHandler> _bodyHandler;
   std::optional<Response> _response;
   // Of the body.
   BodyPace _pace{_owner.bounds.stalled};

@@ -41,9 +41,9 @@ struct Answer {
 // Takes the body of one request. Used on the server's thread, which destroys it, and not before the end of
 // what it was asked for. Where it throws std::bad_alloc, it keeps no function that it was given, and the
 // request is refused.
-class BodyTaker {
+class BodyHandler {
  public:
-  virtual ~BodyTaker() = default;
+  virtual ~BodyHandler() = default;
   // Takes the next bytes from the front, not all of them if that were a long turn: the rest comes again after
   // others had theirs. An answer refuses everything: the connection is closed after it, unless it was the
   // end.
@@ -60,7 +60,7 @@ class BodyTaker {
 class HTTPServer {
  public:
   // Answers a request at its head, or returns who takes its body. On the server's thread.
-  using Handler = std::function<std::variant<Answer, std::unique_ptr<BodyTaker>>(const RequestHead&)>;
+  using Handler = std::function<std::variant<Answer, std::unique_ptr<BodyHandler>>(const RequestHead&)>;
 
   struct Bounds {
     std::size_t connections = 16'000;

@@ -12,8 +12,8 @@
 
 #include "formats/json.h"
 #include "gateway/admin.h"
-#include "gateway/datagram_door.h"
-#include "gateway/door.h"
+#include "gateway/datagram_receiver.h"
+#include "gateway/request_router.h"
 #include "gateway/work_queue.h"
 #include "platform/service_manager.h"
 
@@ -108,14 +108,14 @@ int serve(const Arguments& given) {
   std::unique_ptr<Publisher> publisher = std::move(opened).value();
   WorkQueue bodies;
   if (!bodies.start()) return failed("a thread cannot be started");
-  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
-            [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
-  HTTPServer server([&door](const RequestHead& head) { return door.request(head); },
+  RequestRouter router(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
+                       [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
+  HTTPServer server([&router](const RequestHead& head) { return router.request(head); },
                     {.connections = given.serve.connections, .shortage = given.serve.shed},
                     [&metrics] { metrics.refused.add("no_memory"); });
   const auto listen = server.listen(given.serve.listen);
   if (!listen) return failed("--listen " + listen.error());
-  DatagramDoor datagrams(*publisher, metrics, given.serve.holdMessages / 2);
+  DatagramReceiver datagrams(*publisher, metrics, given.serve.holdMessages / 2);
   Dictionary line{{"listen", asURL(listen.value())}, {"pid", static_cast<long>(::getpid())}};
   if (!given.serve.dashboard.empty()) {
     const auto bound = datagrams.start(given.serve.dashboard);

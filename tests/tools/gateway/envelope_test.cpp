@@ -99,7 +99,7 @@ TEST(Envelope, FillsColumnsWithWhatTheyCanHold) {
 
 TEST(TableRows, AreWhatCopyReads) {
   TableRows rows;
-  Taken message;
+  StreamMessage message;
   message.seq = 9;
   message.time = 1'400'000'000'123'456'789;
   message.via = "call";

@@ -21,8 +21,8 @@ using testing::HasSubstr;
 using testing::StartsWith;
 
 // Answers with the number of its turns and of those that other bodies had meanwhile.
-struct CountingTaker final : BodyTaker {
-  CountingTaker(std::shared_future<void> begin, int& all) : begins(std::move(begin)), turnsOfAll(all) {}
+struct CountingHandler final : BodyHandler {
+  CountingHandler(std::shared_future<void> begin, int& all) : begins(std::move(begin)), turnsOfAll(all) {}
 
   std::optional<Answer> take(std::string_view& bytes) override {
     begins.wait();
@@ -56,8 +56,8 @@ class Server : public testing::Test {
     thread.join();
   }
 
-  std::variant<Answer, std::unique_ptr<BodyTaker>> handle(const RequestHead& head) {
-    if (head.method() == "POST") return std::make_unique<CountingTaker>(begins, turns);
+  std::variant<Answer, std::unique_ptr<BodyHandler>> handle(const RequestHead& head) {
+    if (head.method() == "POST") return std::make_unique<CountingHandler>(begins, turns);
     if (scarce) failed = scarce->hasFailed();
     scarce.reset();
     if (head.method() == "GET") scarce.emplace(granted, true);

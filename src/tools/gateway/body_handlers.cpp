@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Takes events, files and log data.
-#include "gateway/body_takers.h"
+#include "gateway/body_handlers.h"
 
 #include <fmt/format.h>
 
@@ -9,10 +9,10 @@
 #include "formats/json.h"
 #include "formats/property_list.h"
 #include "gateway/attempt.h"
+#include "gateway/buffered_body.h"
 #include "gateway/digest.h"
 #include "gateway/envelope.h"
 #include "gateway/piece_writer.h"
-#include "gateway/received_body.h"
 
 namespace veltrad::gateway {
 
@@ -26,7 +26,7 @@ constexpr std::size_t kLocationDigits = 32;
 constexpr std::size_t kLongTurnBytes = 64u << 10;
 
 // The message's ID and, where the device has sent one, the post's.
-void identify(Message& message, const Wanted& wanted, const std::string& digest) {
+void identify(Message& message, const ParsedRequest& wanted, const std::string& digest) {
   message.id = wanted.postID.empty() ? digest : wanted.postID;
   if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
 }
@@ -41,7 +41,7 @@ std::string headerText(const Dictionary& fields) {
 }
 
 // Has the stream take what the body holds. The request is answered when it has.
-class StreamingTaker : public BodyTaker {
+class StreamingHandler : public BodyHandler {
  public:
   Answer answer() final {
     if (_refusal) return std::move(*_refusal);
@@ -49,7 +49,8 @@ class StreamingTaker : public BodyTaker {
   }
 
  protected:
-  StreamingTaker(const DoorServices& used, Wanted decided) : services(used), wanted(std::move(decided)) {}
+  StreamingHandler(const HandlerServices& used, ParsedRequest decided)
+      : services(used), wanted(std::move(decided)) {}
 
   // Also counts it.
   virtual Answer takenAnswer() = 0;
@@ -62,8 +63,8 @@ class StreamingTaker : public BodyTaker {
     };
   }
 
-  const DoorServices& services;
-  const Wanted wanted;
+  const HandlerServices& services;
+  const ParsedRequest wanted;
 
  private:
   std::optional<Answer> _refusal;
@@ -71,7 +72,7 @@ class StreamingTaker : public BodyTaker {
 };
 
 // A body that is checked when all of it has come.
-class CheckedTaker : public StreamingTaker {
+class BufferedHandler : public StreamingHandler {
  public:
   std::optional<Answer> take(std::string_view& bytes) final { return body.add(bytes); }
   bool hasRoom(std::function<void()>) final { return true; }
@@ -88,15 +89,15 @@ class CheckedTaker : public StreamingTaker {
   }
 
  protected:
-  CheckedTaker(const DoorServices& used, Wanted decided, Charge charge, std::uint64_t most)
-      : StreamingTaker(used, std::move(decided)), body(used, std::move(charge), wanted.packed, most) {}
+  BufferedHandler(const HandlerServices& used, ParsedRequest decided, Charge charge, std::uint64_t most)
+      : StreamingHandler(used, std::move(decided)), body(used, std::move(charge), wanted.packed, most) {}
 
   // Whether a check takes so little time that others may wait for it.
   virtual bool isShort() const = 0;
   // What the body becomes, or why it is refused.
   virtual Result<Message, Answer> check() = 0;
 
-  ReceivedBody body;
+  BufferedBody body;
 
  private:
   void publish(const std::function<void()>& done) {
@@ -113,10 +114,10 @@ class CheckedTaker : public StreamingTaker {
   }
 };
 
-class EventsTaker final : public CheckedTaker {
+class EventsHandler final : public BufferedHandler {
  public:
-  EventsTaker(const DoorServices& used, Wanted decided, Charge charge)
-      : CheckedTaker(used, std::move(decided), std::move(charge), used.bounds.events) {}
+  EventsHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
+      : BufferedHandler(used, std::move(decided), std::move(charge), used.bounds.events) {}
 
  private:
   bool isShort() const override { return body.text().size() <= kLongTurnBytes; }
@@ -145,10 +146,10 @@ class EventsTaker final : public CheckedTaker {
   std::uint64_t _count = 0;
 };
 
-class LogDataTaker final : public CheckedTaker {
+class LogDataHandler final : public BufferedHandler {
  public:
-  LogDataTaker(const DoorServices& used, Wanted decided, Charge charge)
-      : CheckedTaker(used, std::move(decided), std::move(charge), used.bounds.logData) {}
+  LogDataHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
+      : BufferedHandler(used, std::move(decided), std::move(charge), used.bounds.logData) {}
 
  private:
   bool isShort() const override { return false; }
@@ -189,10 +190,10 @@ class LogDataTaker final : public CheckedTaker {
 
 // The stream has most of a large file before its end is known to be good; without the last piece nothing of
 // it comes into the tables.
-class FileTaker final : public StreamingTaker {
+class FileHandler final : public StreamingHandler {
  public:
-  FileTaker(const DoorServices& used, Wanted decided, Charge charge)
-      : StreamingTaker(used, std::move(decided)),
+  FileHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
+      : StreamingHandler(used, std::move(decided)),
         _charge(std::move(charge)),
         _gunzip(used.bounds.unpackedFile),
         _pieces(used.publisher) {
@@ -254,14 +255,17 @@ class FileTaker final : public StreamingTaker {
 
 }  // namespace
 
-std::unique_ptr<BodyTaker> takeEvents(const DoorServices& services, Wanted wanted, Charge charge) {
-  return std::make_unique<EventsTaker>(services, std::move(wanted), std::move(charge));
+std::unique_ptr<BodyHandler> handleEvents(const HandlerServices& services, ParsedRequest wanted,
+                                          Charge charge) {
+  return std::make_unique<EventsHandler>(services, std::move(wanted), std::move(charge));
 }
-std::unique_ptr<BodyTaker> takeFile(const DoorServices& services, Wanted wanted, Charge charge) {
-  return std::make_unique<FileTaker>(services, std::move(wanted), std::move(charge));
+std::unique_ptr<BodyHandler> handleFile(const HandlerServices& services, ParsedRequest wanted,
+                                        Charge charge) {
+  return std::make_unique<FileHandler>(services, std::move(wanted), std::move(charge));
 }
-std::unique_ptr<BodyTaker> takeLogData(const DoorServices& services, Wanted wanted, Charge charge) {
-  return std::make_unique<LogDataTaker>(services, std::move(wanted), std::move(charge));
+std::unique_ptr<BodyHandler> handleLogData(const HandlerServices& services, ParsedRequest wanted,
+                                           Charge charge) {
+  return std::make_unique<LogDataHandler>(services, std::move(wanted), std::move(charge));
 }
 
 }  // namespace veltrad::gateway

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Decides from a request's head.
-#include "gateway/door.h"
+#include "gateway/request_router.h"
 
 #include <fmt/format.h>
 
@@ -9,7 +9,7 @@
 #include <optional>
 
 #include "base/text.h"
-#include "gateway/body_takers.h"
+#include "gateway/body_handlers.h"
 #include "gateway/envelope.h"
 #include "gateway/piece_writer.h"
 
@@ -101,7 +101,7 @@ std::optional<Refusal> faultOfFields(const RequestHead& head, Place place, bool 
 }
 
 // What a body is charged before its first byte. A file is charged once for all that it will keep.
-std::uint64_t firstChargeFor(const Wanted& wanted) {
+std::uint64_t firstChargeFor(const ParsedRequest& wanted) {
   const std::uint64_t open = kOpenBodyBytes + (wanted.packed ? kUnpackingBytes : 0);
   return wanted.place == Place::upload
              ? open + std::min(wanted.length.value_or(kMostFileBytes), kMostFileBytes)
@@ -110,11 +110,11 @@ std::uint64_t firstChargeFor(const Wanted& wanted) {
 
 }  // namespace
 
-Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds) {
+Result<ParsedRequest, Refusal> parsedRequest(const RequestHead& head, const BodyBounds& bounds) {
   const std::string_view target = head.target();
   const std::string_view path = target.substr(0, target.find('?'));
   const auto place = placeOf(path);
-  Wanted wanted;
+  ParsedRequest wanted;
   if (place == Place::events && path.size() > kEventsPath.size())
     wanted.via = path.substr(kEventsPath.size() + 1);
   if (!place || (path.size() > kEventsPath.size() && *place == Place::events && !isLabel(wanted.via)))
@@ -139,19 +139,19 @@ Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& boun
   return wanted;
 }
 
-std::variant<Answer, std::unique_ptr<BodyTaker>> Door::request(const RequestHead& head) {
-  auto wanted = wantedBy(head, _services.bounds);
+std::variant<Answer, std::unique_ptr<BodyHandler>> RequestRouter::request(const RequestHead& head) {
+  auto wanted = parsedRequest(head, _services.bounds);
   if (!wanted) return _refusals.answer(wanted.error());
   const Place place = wanted.value().place;
   Charge charge(place == Place::events ? _events : _others);
   if (!charge.to(firstChargeFor(wanted.value()))) return _refusals.busy("no_room");
   switch (place) {
     case Place::events:
-      return takeEvents(_services, std::move(wanted).value(), std::move(charge));
+      return handleEvents(_services, std::move(wanted).value(), std::move(charge));
     case Place::upload:
-      return takeFile(_services, std::move(wanted).value(), std::move(charge));
+      return handleFile(_services, std::move(wanted).value(), std::move(charge));
     case Place::logData:
-      return takeLogData(_services, std::move(wanted).value(), std::move(charge));
+      return handleLogData(_services, std::move(wanted).value(), std::move(charge));
   }
   return Answer{404, "", "", {}};
 }

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Receives datagrams with the address that they came to, from which they are acknowledged.
-#include "gateway/datagram_door.h"
+#include "gateway/datagram_receiver.h"
 
 #include <arpa/inet.h>
 #include <poll.h>
@@ -91,7 +91,7 @@ Message messageOfDatagram(std::string_view datagram) {
   return {subject::kDatagrams, digestOf("/dashboard", datagram), {}, formats::writeJSON(fields)};
 }
 
-Result<std::string, std::string> DatagramDoor::start(const std::string& text) {
+Result<std::string, std::string> DatagramReceiver::start(const std::string& text) {
   auto address = addressOf(text);
   if (!address) return Failure{text + ": expected ADDRESS:PORT, with an IPv4 address"};
   socklen_t length = sizeof *address;
@@ -112,13 +112,13 @@ Result<std::string, std::string> DatagramDoor::start(const std::string& text) {
   return text.substr(0, text.rfind(':') + 1) + std::to_string(ntohs(address->sin_port));
 }
 
-void DatagramDoor::stop() {
+void DatagramReceiver::stop() {
   if (!_thread.running()) return;
   ::eventfd_write(_stopping.get(), 1);
   _thread.join();
 }
 
-void DatagramDoor::run() {
+void DatagramReceiver::run() {
   // One byte more than a datagram may have tells one that is too long.
   char room[tools::kMostPacketBytes + 1];
   pollfd watched[] = {{_socket->descriptor.get(), POLLIN, 0}, {_stopping.get(), POLLIN, 0}};
@@ -133,7 +133,7 @@ void DatagramDoor::run() {
   }
 }
 
-bool DatagramDoor::receive(char* room, std::size_t size) {
+bool DatagramReceiver::receive(char* room, std::size_t size) {
   Sender sender;
   Control control{};
   iovec part{room, size};
@@ -161,7 +161,7 @@ bool DatagramDoor::receive(char* room, std::size_t size) {
   return true;
 }
 
-void DatagramDoor::handle(const Sender& sender, std::string_view datagram) {
+void DatagramReceiver::handle(const Sender& sender, std::string_view datagram) {
   if (const char* fault = faultName(datagram)) return _metrics.datagrams.add(fault);
   if (_socket->underWay >= _most) return _metrics.datagrams.add("no_room");
   std::string answer = tools::asksForAcknowledgement(datagram) ? tools::acknowledgementOf(datagram) : "";
@@ -177,7 +177,7 @@ void DatagramDoor::handle(const Sender& sender, std::string_view datagram) {
   _publisher.publish(std::move(message), std::move(completion));
 }
 
-void DatagramDoor::acknowledge(const Socket& socket, const Sender& sender, const std::string& header) {
+void DatagramReceiver::acknowledge(const Socket& socket, const Sender& sender, const std::string& header) {
   Control control{};
   iovec part{const_cast<char*>(header.data()), header.size()};
   msghdr message{};

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The door for devices' requests: which path takes what, and who takes the body.
+// Devices' requests: which path takes what, and which handler gets the body.
 #pragma once
 
 #include <functional>
@@ -36,8 +36,8 @@ struct BodyBounds {
 // Runs a long turn where it keeps nobody waiting, on any thread, now or later.
 using Aside = std::function<void(std::function<void()>)>;
 
-// What those who take bodies use. All of it must outlive them.
-struct DoorServices {
+// What handlers of bodies use. All of it must outlive them.
+struct HandlerServices {
   Publisher& publisher;
   Metrics& metrics;
   Refusals& refusals;
@@ -47,7 +47,7 @@ struct DoorServices {
 
 enum class Place { events, upload, logData };
 // What a request wants, decided from its head alone.
-struct Wanted {
+struct ParsedRequest {
   Place place;
   std::string path;
   // The label behind "/events/".
@@ -60,24 +60,24 @@ struct Wanted {
   // Of the body, where the head says it.
   std::optional<std::uint64_t> length;
 };
-Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds);
+Result<ParsedRequest, Refusal> parsedRequest(const RequestHead& head, const BodyBounds& bounds);
 
 // On the server's thread.
-class Door {
+class RequestRouter {
  public:
-  Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed, Aside aside)
+  RequestRouter(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed, Aside aside)
       : _refusals(publisher, metrics, shed),
         _events(bounds.eventsTogether),
         _others(bounds.othersTogether),
         _services{publisher, metrics, _refusals, bounds, std::move(aside)} {}
 
-  std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
+  std::variant<Answer, std::unique_ptr<BodyHandler>> request(const RequestHead& head);
 
  private:
   Refusals _refusals;
   ByteBudget _events;
   ByteBudget _others;
-  const DoorServices _services;
+  const HandlerServices _services;
 };
 
 }  // namespace veltrad::gateway
