@@ -26,9 +26,9 @@ constexpr std::size_t kLocationDigits = 32;
 constexpr std::size_t kLongTurnBytes = 64u << 10;
 
 // The message's ID and, where the device has sent one, the post's.
-void identify(Message& message, const ParsedRequest& wanted, const std::string& digest) {
-  message.id = wanted.postID.empty() ? digest : wanted.postID;
-  if (!wanted.postID.empty()) message.headers.emplace_back(header::kPostID, wanted.postID);
+void identify(Message& message, const ParsedRequest& request, const std::string& digest) {
+  message.id = request.postID.empty() ? digest : request.postID;
+  if (!request.postID.empty()) message.headers.emplace_back(header::kPostID, request.postID);
 }
 
 // Servers look for a header's name in the whole text of all, so no other one may hold what begins like
@@ -49,8 +49,8 @@ class StreamingHandler : public BodyHandler {
   }
 
  protected:
-  StreamingHandler(const HandlerServices& used, ParsedRequest decided)
-      : services(used), wanted(std::move(decided)) {}
+  StreamingHandler(const HandlerServices& used, ParsedRequest given)
+      : services(used), request(std::move(given)) {}
 
   // Also counts it.
   virtual Answer takenAnswer() = 0;
@@ -64,7 +64,7 @@ class StreamingHandler : public BodyHandler {
   }
 
   const HandlerServices& services;
-  const ParsedRequest wanted;
+  const ParsedRequest request;
 
  private:
   std::optional<Answer> _refusal;
@@ -89,8 +89,8 @@ class BufferedHandler : public StreamingHandler {
   }
 
  protected:
-  BufferedHandler(const HandlerServices& used, ParsedRequest decided, Charge charge, std::uint64_t most)
-      : StreamingHandler(used, std::move(decided)), body(used, std::move(charge), wanted.packed, most) {}
+  BufferedHandler(const HandlerServices& used, ParsedRequest given, Charge charge, std::uint64_t most)
+      : StreamingHandler(used, std::move(given)), body(used, std::move(charge), request.packed, most) {}
 
   // Whether a check takes so little time that others may wait for it.
   virtual bool isShort() const = 0;
@@ -116,8 +116,8 @@ class BufferedHandler : public StreamingHandler {
 
 class EventsHandler final : public BufferedHandler {
  public:
-  EventsHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
-      : BufferedHandler(used, std::move(decided), std::move(charge), used.bounds.events) {}
+  EventsHandler(const HandlerServices& used, ParsedRequest given, Charge charge)
+      : BufferedHandler(used, std::move(given), std::move(charge), used.bounds.events) {}
 
  private:
   bool isShort() const override { return body.text().size() <= kLongTurnBytes; }
@@ -131,8 +131,8 @@ class EventsHandler final : public BufferedHandler {
           "events", fmt::format("{} events, at most {} are taken", _count, services.bounds.eventsInOne),
           body.text())};
     Message message{subject::kEvents, "", {}, {}};
-    identify(message, wanted, digestOf(wanted.path, body.text()));
-    if (!wanted.via.empty()) message.headers.emplace_back(header::kVia, wanted.via);
+    identify(message, request, digestOf(request.path, body.text()));
+    if (!request.via.empty()) message.headers.emplace_back(header::kVia, request.via);
     message.body = body.take();
     return message;
   }
@@ -148,8 +148,8 @@ class EventsHandler final : public BufferedHandler {
 
 class LogDataHandler final : public BufferedHandler {
  public:
-  LogDataHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
-      : BufferedHandler(used, std::move(decided), std::move(charge), used.bounds.logData) {}
+  LogDataHandler(const HandlerServices& used, ParsedRequest given, Charge charge)
+      : BufferedHandler(used, std::move(given), std::move(charge), used.bounds.logData) {}
 
  private:
   bool isShort() const override { return false; }
@@ -157,10 +157,10 @@ class LogDataHandler final : public BufferedHandler {
   Result<Message, Answer> check() override {
     auto text = json();
     if (!text) return Failure{std::move(text.error())};
-    const std::string digest = digestOf(wanted.path, body.text());
+    const std::string digest = digestOf(request.path, body.text());
     _location = "/logdata/" + digest.substr(0, kLocationDigits);
     Message message{subject::kLogData, "", {{header::kLocation, _location}}, std::move(text).value()};
-    identify(message, wanted, digest);
+    identify(message, request, digest);
     return message;
   }
 
@@ -192,12 +192,12 @@ class LogDataHandler final : public BufferedHandler {
 // it comes into the tables.
 class FileHandler final : public StreamingHandler {
  public:
-  FileHandler(const HandlerServices& used, ParsedRequest decided, Charge charge)
-      : StreamingHandler(used, std::move(decided)),
+  FileHandler(const HandlerServices& used, ParsedRequest given, Charge charge)
+      : StreamingHandler(used, std::move(given)),
         _charge(std::move(charge)),
         _gunzip(used.bounds.unpackedFile),
         _pieces(used.publisher) {
-    _message.add(wanted.path);
+    _message.add(request.path);
     // A content that begins like the end of another path is another file.
     _message.add(std::string_view("\0", 1));
   }
@@ -208,7 +208,7 @@ class FileHandler final : public StreamingHandler {
     std::string_view unpacked = bytes;
     const auto state = _gunzip.add(bytes, [this](std::string_view content) {
       _content.add(content);
-      if (wanted.postID.empty()) _message.add(content);
+      if (request.postID.empty()) _message.add(content);
     });
     unpacked.remove_suffix(bytes.size());
     _received += unpacked.size();
@@ -230,7 +230,7 @@ class FileHandler final : public StreamingHandler {
                           {"filename", parameter("filename")}, {"description", parameter("description")},
                           {"sha256", _content.hexDigits()},    {"bytes", _gunzip.unpackedBytes()}};
     Message message{subject::kFiles, "", {{header::kFile, headerText(file)}}, {}};
-    identify(message, wanted, _message.hexDigits());
+    identify(message, request, _message.hexDigits());
     _pieces.commit(std::move(message), ending(done));
   }
 
@@ -241,8 +241,8 @@ class FileHandler final : public StreamingHandler {
     return answer;
   }
   std::string parameter(const char* name) const {
-    const auto found = wanted.query.find(name);
-    return found == wanted.query.end() ? "" : found->second;
+    const auto found = request.query.find(name);
+    return found == request.query.end() ? "" : found->second;
   }
 
   const Charge _charge;
@@ -255,17 +255,13 @@ class FileHandler final : public StreamingHandler {
 
 }  // namespace
 
-std::unique_ptr<BodyHandler> handleEvents(const HandlerServices& services, ParsedRequest wanted,
-                                          Charge charge) {
-  return std::make_unique<EventsHandler>(services, std::move(wanted), std::move(charge));
-}
-std::unique_ptr<BodyHandler> handleFile(const HandlerServices& services, ParsedRequest wanted,
+std::unique_ptr<BodyHandler> handlerFor(const HandlerServices& services, ParsedRequest request,
                                         Charge charge) {
-  return std::make_unique<FileHandler>(services, std::move(wanted), std::move(charge));
-}
-std::unique_ptr<BodyHandler> handleLogData(const HandlerServices& services, ParsedRequest wanted,
-                                           Charge charge) {
-  return std::make_unique<LogDataHandler>(services, std::move(wanted), std::move(charge));
+  if (request.place == Place::events)
+    return std::make_unique<EventsHandler>(services, std::move(request), std::move(charge));
+  if (request.place == Place::upload)
+    return std::make_unique<FileHandler>(services, std::move(request), std::move(charge));
+  return std::make_unique<LogDataHandler>(services, std::move(request), std::move(charge));
 }
 
 }  // namespace veltrad::gateway

@@ -8,14 +8,10 @@
 
 namespace veltrad::gateway {
 
-// `charge` has what the body is charged at first.
-// An envelope: 200 without a body.
-std::unique_ptr<BodyHandler> handleEvents(const HandlerServices& services, ParsedRequest wanted,
-                                          Charge charge);
-// A gzip stream, which is handed on as it comes: 200 and {"success":true}.
-std::unique_ptr<BodyHandler> handleFile(const HandlerServices& services, ParsedRequest wanted, Charge charge);
-// A property list of an array: 200 and the place where it is said to be.
-std::unique_ptr<BodyHandler> handleLogData(const HandlerServices& services, ParsedRequest wanted,
-                                           Charge charge);
+// `charge` has what the body is charged at first. Of events the body is an envelope, answered 200 without a
+// body; of an upload a gzip stream, which is handed on as it comes, answered {"success":true}; of log data a
+// property list of an array, answered the place where it is said to be.
+std::unique_ptr<BodyHandler> handlerFor(const HandlerServices& services, ParsedRequest request,
+                                        Charge charge);
 
 }  // namespace veltrad::gateway
