@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What a message costs in counts that do not depend on what else the machine does: instructions of the daemon (callgrind), page
+"""Counts the cost of a message independently of the load of the machine: instructions of the daemon (callgrind), page
 faults, waits and system calls (strace), the last three of clients that wait for each reply. counts.json holds the last record."""
 import contextlib
 import json
@@ -34,7 +34,7 @@ class NothingPosted(Exception):
 
 
 def run(place, client, posted):
-    """Sends. Whoever is `posted` waits for the answer to the last post."""
+    """Sends messages. With `posted`, waits for the answer to the last post."""
     before = place.sink.requests()
     client.run()
     if posted and place.sink.requests() == before:
@@ -43,7 +43,7 @@ def run(place, client, posted):
 
 @contextlib.contextmanager
 def under_callgrind(place, counted, *more):
-    """A daemon whose instructions are added to `counted`, those of its start only without `more`."""
+    """Runs a daemon and adds its instructions to `counted`; without `more`, only those of its start."""
     (place.root.path / "run/veltrad").mkdir(parents=True, exist_ok=True)  # callgrind opens its file before the daemon runs
     log = place.root.path / "callgrind.log"
     wrapper = (found("valgrind"), "--tool=callgrind", f"--callgrind-out-file={place.root.path}/run/veltrad/callgrind.out",
@@ -64,7 +64,7 @@ def instructions_of_messages(place, way, client_type, tries=5):
 
 
 def keep_storebag(place, way, client_type):
-    """Has a daemon at full speed keep the storebag, because a slow one may not get it within its time limit."""
+    """Makes a daemon at full speed keep the storebag, because a slow one may exceed the time limit of the fetch."""
     place.root.write("etc/veltrad/settings.json", json.dumps({"storebags": {"persist": True}}).encode())
     with place.daemon(), place.client(way, client_type, 1, 1) as client:
         client.run()
@@ -129,7 +129,7 @@ def measure(place):
 
 
 def libraries():
-    """What else changes the counts: the compiler and the libraries that are linked."""
+    """The compiler and the linked libraries, which also affect the counts."""
     compiler = subprocess.run([found("gcc"), "-dumpfullversion"], capture_output=True, text=True, check=True).stdout.strip()
     linked = subprocess.run(["ldd", program("veltrad")], capture_output=True, text=True, check=True).stdout
     paths = [pathlib.Path(path).resolve().name for path in re.findall(r"=> (\S+)", linked)]
@@ -138,7 +138,7 @@ def libraries():
 
 
 def compare(before, now):
-    """Lines of what has grown by more than a twentieth."""
+    """A line for each count that has grown by more than a twentieth."""
     grown = []
     for kind, counts in now.items():
         for name, count in counts.items():

@@ -6,7 +6,7 @@ import statistics
 
 @dataclasses.dataclass
 class Figure:
-    """Of each round one value and, where there is a floor, what the floor was in that round. The target is of the ratio to the
+    """Holds one value for each round and, if there is a floor, the floor of that round. The target applies to the ratio to the
     floor if there is one."""
     name: str
     unit: str

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Idle connections, and a good client beside hostile ones."""
+"""Measures idle connections, and a well-behaved client among hostile ones."""
 import os
 import random
 import subprocess
@@ -24,7 +24,7 @@ SHARE, FIRST_USER = 1000, 64_000  # connections of one user; the daemon takes 1,
 
 
 class Idle(Measure):
-    """Connections that say nothing: 4,096 of several users, where the caller is root and can be them."""
+    """4,096 idle connections, of several users if the caller is root."""
 
     def round(self):
         users = [FIRST_USER + number for number in range(4)] if os.geteuid() == 0 else []
@@ -71,7 +71,7 @@ class Attack(Measure):
                 wire.raw(draw.choice((b"\xff" * 12, draw.randbytes(200), (60_000).to_bytes(4, "big") + b"\x02\0\0\0\0\0\0\x01half")))
                 kept.append(wire)
             except (OSError, AssertionError, ValueError):
-                pass  # refused, or ended while it spoke: what an attacker must expect
+                pass  # refused, or closed while it was sending: expected for an attacker
             if len(kept) > 100:
                 kept.pop(0).close()
         for wire in kept:

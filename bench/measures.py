@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-"""The measurements of the message road. Each takes one value of each of its figures in every round, with the floor beside it, so
-that figure and floor meet the same machine."""
+"""Measures the path of a message. Each class takes one value of each of its figures in every round, with the floor beside it, so
+that figure and floor are measured under the same conditions."""
 import statistics
 import time
 

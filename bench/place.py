@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Where measurements take place: a root directory, the lab that serves the storebags, nginx as the collector, daemons with their
+"""The environment of measurements: a root, the lab that serves the storebags, nginx as the collector, daemons with their
 clients, and what the kernel knows of a process."""
 import contextlib
 import json
@@ -41,7 +41,7 @@ http {{ access_log off; client_max_body_size 0; keepalive_requests 100000000; ke
 
 
 def found(name, *folders):
-    """The path of a program that may stand where users do not look."""
+    """The path of a program, which may be in a directory outside the PATH of users."""
     path = shutil.which(name, path=os.pathsep.join([os.environ["PATH"], "/usr/sbin", "/sbin", *map(str, folders)]))
     if not path:
         sys.exit(f"scripts/bench: {name} is missing; scripts/setup {name} installs it")
@@ -69,14 +69,14 @@ class Sink:
             return None
 
     def requests(self):
-        """How many requests have come, those of this question left out."""
+        """The number of requests so far, without those of this function."""
         with urllib.request.urlopen(f"http://127.0.0.1:{self.status_port}/status") as answer:
             text = answer.read().decode()
         self._asked = getattr(self, "_asked", 0) + 1
         return int(re.search(r"requests\s+\d+ \d+ (\d+)", text).group(1)) - self._asked + 1
 
     def bodies(self):
-        """The bodies of posts to the slow port, which it then forgets."""
+        """The bodies of posts to the slow port, which are then deleted."""
         for path in sorted((self.path / "body").iterdir()):
             yield path.read_bytes()
             path.unlink()
@@ -111,10 +111,10 @@ class Client:
 
 
 class Place:
-    """A daemon's surroundings. Every daemon starts with the storebags of all client types above."""
+    """The root, lab and collector of a daemon. Every daemon starts with the storebags of all client types above."""
 
     def __init__(self):
-        found("nginx")  # before the lab starts, which nobody would stop
+        found("nginx")  # before the lab starts, because nothing would stop the lab after a failure
         self.root, self.lab = Root(), Lab()
         self.root.use(self.lab)
         self.sink = Sink(self.lab)
@@ -165,7 +165,7 @@ class Place:
         return json.loads(done.stdout)
 
     def capture(self):
-        """Keeps a post of 50 events as the daemon makes them, from which bodies of other sizes are made, and the size of a
+        """Stores a post of 50 events as the daemon makes it, from which bodies of other sizes are made, and the size of a
         datagram of the same message."""
         with self.daemon():
             for client_type in (CAPTURED, DATAGRAMS):
@@ -208,7 +208,7 @@ def page_faults(pid):
 
 
 def context_switches(pid):
-    """Those with which a thread waits, of the threads that live."""
+    """Voluntary context switches of the threads that are alive."""
     texts = [task.read_text() for task in pathlib.Path(f"/proc/{pid}/task").glob("*/status")]
     return sum(int(re.search(r"^voluntary_ctxt_switches:\s+(\d+)", text, re.M).group(1)) for text in texts)
 
@@ -219,7 +219,7 @@ def memory_kib(pid, *keys):
 
 
 def cores():
-    """How many this run may use."""
+    """The number of cores that this run may use."""
     return len(os.sched_getaffinity(0))
 
 

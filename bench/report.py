@@ -31,7 +31,7 @@ def git(*words):
 
 
 class Run:
-    """What one run has found. The load is that of the machine when the run began and when it ended, its own included."""
+    """The results of one run. The load is that of the machine when the run began and when it ended, its own included."""
 
     def __init__(self, rounds, quick):
         self.rounds, self.quick, self.began = rounds, quick, os.getloadavg()[0]

@@ -85,7 +85,7 @@ def main():
             run.counts = counts.measure(place)
         whole = not given.quick and not given.only and not given.pin
         if whole:
-            run.write()  # a peer that fails takes nothing with it
+            run.write()  # a peer that fails does not end the run
         if given.peers or given.fluent_bit:
             run.peers = peers.measure(place, given)
         print(run.terminal())

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What drawings have in common: a style for light and dark pages that can be read on a phone, and texts."""
+"""Shared parts of drawings: a style for light and dark pages that is readable on a phone, and texts."""
 
 STYLE = """text { font: 14px system-ui, sans-serif; fill: #222 } .title { font-size: 16px; font-weight: 600 }
 .small { font-size: 12px } .grid { stroke: #d8dbe0 } .back { fill: #fff }

@@ -1,8 +1,8 @@
 # SPDX-License-Identifier: Apache-2.0
-# What shortens a build without changing its result: precompiled headers and lld, for the presets that use Clang. Unity builds
+# Shortens the build without changing its result: precompiled headers and lld, for the presets that use Clang. Unity builds
 # are switched on in CMakePresets.json. Figures: docs/decisions/0017-build-time.md.
 
-# GCC builds, as shipped, read every header afresh, which shows includes that are missing. So do builds through a compiler
+# GCC builds, as shipped, read every header again, which reveals missing includes. So do builds through a compiler
 # cache, because it can hardly share files that were compiled with a precompiled header.
 set(VELTRA_PRECOMPILE_DEFAULT OFF)
 if(CMAKE_CXX_COMPILER_ID STREQUAL "Clang" AND NOT CMAKE_CXX_COMPILER_LAUNCHER)

@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# Finds what veltra-gateway is built on and settles VELTRA_GATEWAY, which is AUTO unless somebody has said ON or OFF: then the
-# program is built where all of it is found.
+# Finds the libraries of veltra-gateway and sets VELTRA_GATEWAY to ON or OFF. AUTO, the default, builds the program if all
+# libraries are found.
 pkg_check_modules(NATS QUIET IMPORTED_TARGET libnats)
 pkg_check_modules(PQ QUIET IMPORTED_TARGET libpq)
 find_package(Boost QUIET)
@@ -23,7 +23,7 @@ foreach(row "NATS|libnats|libnats-dev" "PQ|libpq|libpq-dev" "BEAST|Boost.Beast|l
 endforeach()
 list(JOIN missing ", " missing)
 
-# The variable hides the cache entry, so that a later configuration looks again.
+# The variable hides the cache entry, so that a later configuration searches again.
 if(NOT missing)
   set(VELTRA_GATEWAY ON)
 elseif(VELTRA_GATEWAY STREQUAL AUTO)

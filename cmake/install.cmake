@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-# What cmake --install puts where, by component: daemon, library, development, tools, lab, gateway, python. Everything is relative to
-# the prefix, except that /usr has its configuration in /etc.
+# The installation, by component: daemon, library, development, tools, lab, gateway, python. All paths are relative to the prefix,
+# except that /usr has its configuration in /etc.
 include(CMakePackageConfigHelpers)
 
 set(UNIT_DIRECTORY lib/systemd/system)

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Draws what came of a simulation: panels one below the other, over one axis of hours, for a page and for a phone."""
+"""Draws the results of a simulation: panels one below the other, over one axis of hours, for a page and for a phone."""
 import math
 import pathlib
 import sys
@@ -14,7 +14,7 @@ OWN = """.area { fill-opacity: .25; stroke-width: 1.2 } .shade { fill: #c33; fil
 
 
 def nice(value):
-    """The next number that an axis may end with."""
+    """The next round number at which an axis may end."""
     if value <= 0:
         return 1
     power = 10 ** math.floor(math.log10(value))
@@ -63,7 +63,7 @@ def panel(one, y, hours, shades, top):
 
 
 def drawing(title, panels, hours, shades):
-    """Panels with the same "scale" have the same axis. `shades`: the hours from and to which something was amiss."""
+    """Panels with the same "scale" have the same axis. `shades`: begin and end, in hours, of the disturbances."""
     tops = {}
     for one in panels:
         most = max(max(values) for values in one["curves"])

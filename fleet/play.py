@@ -68,7 +68,7 @@ def counts(fleet):
 def once(fleet):
     """Returns the exit status."""
     play(fleet)
-    # A daemon that ends has its posts answered and its datagrams acknowledged first.
+    # A daemon waits for the answers to its posts and the acknowledgements of its datagrams before it ends.
     fleet.kill("daemon", signal.SIGTERM)
     side.wait_until(lambda: not side.alive(fleet.facts["pids"]["daemon"]), "the daemon's end")
     side.wait_until(fleet.is_carried, "the examples are in the tables")

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""The other side on one machine: its parts as processes in one directory, which fleet.json there describes."""
+"""Runs the servers of a fleet on one machine, as processes in one directory that fleet.json there describes."""
 import contextlib
 import glob
 import json
@@ -38,7 +38,7 @@ class Missing(Exception):
 
 
 class Ended(BaseException):
-    """Somebody has asked this program to end."""
+    """A signal has asked this program to end."""
 
 
 class Signals:
@@ -80,7 +80,7 @@ signals = Signals()
 
 
 def run(*command, **more):
-    """What a short program prints. It runs to its end whatever comes, also if Ctrl-C is pressed in its terminal."""
+    """Returns the output of a short program, which runs to its end even if Ctrl-C is pressed in the terminal."""
     with signals.whole():
         done = subprocess.run(command, capture_output=True, text=True, start_new_session=True, **more)
     if done.returncode != 0:
@@ -89,7 +89,7 @@ def run(*command, **more):
 
 
 def program(name):
-    """Of the build if it is there, else of the system."""
+    """The path of a program: of the build if it is there, else of the system."""
     places = [BUILD / "bin" / name, pathlib.Path("/usr/libexec") / name, *map(pathlib.Path, glob.glob(f"/usr/lib/postgresql/*/bin/{name}")),
               pathlib.Path("/usr/sbin") / name]
     for place in places:
@@ -101,7 +101,7 @@ def program(name):
 
 
 def check_programs():
-    """Before anything starts."""
+    """Checks before anything starts that all programs are there."""
     for name in PROGRAMS:
         program(name)
 
@@ -134,7 +134,7 @@ def answers(url):
 
 
 def stat(pid):
-    """What the kernel says of a process, from its state on; nothing if there is none."""
+    """The fields of /proc/PID/stat from the state on; None if there is no such process."""
     with contextlib.suppress(OSError):
         return pathlib.Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()
     return None
@@ -151,7 +151,7 @@ def filled(name, values):
 
 
 class Fleet:
-    """All parts. What start() needs to know stands in fleet.json, so that another process can start parts again."""
+    """All parts. The data for start() is in fleet.json, so that another process can start parts again."""
 
     def __init__(self, path, facts):
         self.path, self.facts = pathlib.Path(path), facts
@@ -168,7 +168,7 @@ class Fleet:
 
     @classmethod
     def make(cls, **options):
-        """With all that the parts read."""
+        """Makes a fleet with everything that the parts read."""
         fleet = cls.plan(**options)
         try:
             fleet.configure()
@@ -245,7 +245,7 @@ class Fleet:
         return [program("setpriv"), "--reuid=postgres", "--regid=postgres", "--init-groups", *command]
 
     def make_database(self):
-        """Whoever can reach its socket is its superuser, so its folder is closed to others."""
+        """Everybody who can reach its socket is its superuser, so its folder is closed to others."""
         folder = self.path / "postgres"
         folder.chmod(0o700)
         if os.getuid() == 0:
@@ -317,12 +317,12 @@ class Fleet:
         return started
 
     def runs(self, name):
-        """False also if the number of its process belongs to another one by now."""
+        """False also if the process ID now belongs to another process."""
         found = stat(self.facts["pids"].get(name, -1))
         return bool(found) and found[STATE] != "Z" and found[BEGIN] == self.facts["begun"][name]
 
     def end(self, name):
-        """Kills the part with all processes that it has begun, which may have outlived it."""
+        """Kills the part and all processes that it has started, which may have outlived it."""
         pid = self.facts["pids"].get(name, -1)
         if alive(pid) and not self.runs(name):
             return
@@ -352,7 +352,7 @@ class Fleet:
         def ready(name):
             child = children.get(name)
             if child and child.poll() is not None or not self.runs(name):
-                # Also what a killed server has left may have to end first.
+                # Processes that a killed server has left behind may have to end first.
                 children[name] = self.begin(name)
                 time.sleep(0.1)
             return self.is_ready(name)
@@ -381,7 +381,7 @@ class Fleet:
         return [line.split("\x1f") for line in rows.split("\n")[:-1]]
 
     def table(self, sql):
-        """The same as psql shows it."""
+        """The same, formatted as by psql."""
         return run(program("psql"), "-qX", "-c", sql, self.dsn)
 
     def is_carried(self):
@@ -410,7 +410,7 @@ class Fleet:
             self.end(name)
 
     def remove(self):
-        """What a killed server has left may still write for a moment."""
+        """Processes that a killed server has left behind may still write for a moment."""
         wait_until(lambda: shutil.rmtree(self.path, ignore_errors=True) or not self.path.exists(), f"{self.path} is gone", 10)
 
 

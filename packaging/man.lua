@@ -1,4 +1,4 @@
--- For pandoc: gives manual pages made from docs/reference the form that readers of manual pages know.
+-- A pandoc filter: formats manual pages made from docs/reference in the usual form of manual pages.
 
 -- An item of a list is a term and its description, which begins after the first colon.
 function BulletList(list)
@@ -24,7 +24,7 @@ function BulletList(list)
   return pandoc.DefinitionList(items)
 end
 
--- Links to other pages name them already.
+-- The text of a link already names the page.
 function Link(link)
   return pandoc.Strong(link.content)
 end

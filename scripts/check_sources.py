@@ -48,7 +48,7 @@ def is_script(path):
 
 
 def check_license(add=False):
-    """Every source names its license in its first line, or after "#!"; with --add-license the line is put where it is missing."""
+    """Every source names its license in its first line, or after "#!". --add-license adds missing lines."""
     found = []
     for path in licensed():
         text = path.read_text()
@@ -119,7 +119,7 @@ def git(*arguments):
 
 
 def changed_files(given=None):
-    """What differs from the given commit, else from the commit where this branch left origin/main or, on main itself and
+    """Files that differ from the given commit, else from the commit where this branch left origin/main or, on main itself and
     without a remote, from the commit before this one. Nothing, which is said, where there is no such commit."""
     base = git("rev-parse", "--verify", given) if given else git("merge-base", "HEAD", "origin/main")
     if not given and (not base or base == git("rev-parse", "HEAD")):
@@ -131,7 +131,7 @@ def changed_files(given=None):
 
 
 def body_for(header, bodies):
-    """A body that includes the header, its own one if there is one."""
+    """A body that includes the header, preferably the header's own body."""
     includes = re.compile(rf'#include ["<](.*/)?{re.escape(header.name)}[">]')
     for body in sorted(bodies, key=lambda path: (path.stem != header.stem, path)):
         if includes.search(body.read_text()):

@@ -58,7 +58,7 @@ def run(command, environment):
 
 
 def programs(preset, with_fleet):
-    """What runs two at a time, and what runs alone after it."""
+    """The test programs that run two at a time, and those that then run alone."""
     binaries = ROOT / "build" / preset / "bin"
     together = [[str(program), "--gtest_brief=1"] for program in sorted(binaries.glob("test_*"))]
     together += [[str(program), "tests/fuzz/corpus/" + program.name.removeprefix("replay_")]

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""A session's way to veltrad: a bounded queue, and the thread that connects, writes, reads and runs callbacks."""
+"""A session's connection to veltrad: a bounded queue, and the thread that connects, writes, reads and runs callbacks."""
 
 from __future__ import annotations
 
@@ -207,7 +207,7 @@ class Connection:
             self._wake = -1
 
     def _step(self) -> None:
-        """Does what is due, then waits until something can be read or written, and does it."""
+        """Handles what is due, then waits for the socket and reads or writes."""
         with self._lock:
             now = time.monotonic()
             if self._phase is _Phase.WAITING and now >= self._next:

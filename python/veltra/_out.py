@@ -35,10 +35,10 @@ class Out(NamedTuple):
 
 
 class OutFrames:
-    """Keeps calls in order and writes them without blocking. What no connection has taken any byte of waits for the next one.
+    """Keeps calls in order and writes them without blocking. A call of which no byte was written waits for the next connection.
 
     most: the bytes that may wait; a single call may be larger.
-    call_id: gives a call its ID when its turn has come, 0 if it asks for no answer.  wrote: told of each call that is written.
+    call_id: gives a call its ID when it is to be written, 0 if it asks for no answer.  wrote: told of each call that is written.
     """
 
     def __init__(self, most: int, call_id: Callable[[Out], int], wrote: Callable[[Out, int], None]) -> None:
@@ -63,7 +63,7 @@ class OutFrames:
         return True
 
     def withdraw(self, out: Out) -> bool:
-        """False: it does not wait, or its writing has begun."""
+        """False: it is not waiting, or a part of it was written."""
         if out not in self._calls or self._begun:
             return False
         self._calls.remove(out)
@@ -71,7 +71,7 @@ class OutFrames:
         return True
 
     def connect(self, first: bytes) -> None:
-        """There is a new connection. The calls wait until release()."""
+        """A new connection exists. The calls wait until release()."""
         self._first, self._released, self._held = first, False, False
 
     def release(self) -> None:
@@ -96,11 +96,11 @@ class OutFrames:
         return dropped
 
     def writes(self) -> bool:
-        """Something waits for room in the socket."""
+        """True if something waits for room in the socket."""
         return not self._held and bool(self._first or (self._released and self._calls))
 
     def write(self, end: socket.socket) -> bool:
-        """Writes as much as goes at once. False: nothing more for now."""
+        """Writes as much as possible without waiting. False: the socket takes no more for now."""
         if not self.writes():
             return False
         if not self._first and not self._rest:
@@ -111,7 +111,7 @@ class OutFrames:
         except BlockingIOError:
             return False
         except OSError:
-            self._held = True  # the reader will find the end, and what the daemon has said before it
+            self._held = True  # the reader will find the end of the connection, and what the daemon sent before it
             return False
         if self._first:
             self._first = data[taken:]

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""A daemon for tests of programs that report, in the test's own process. It takes in every message and sends nothing anywhere.
+"""A daemon for tests of programs that report, in the test's own process. It accepts every message and sends nothing.
 
     import veltra.testing
 

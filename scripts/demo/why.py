@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Why two messages of the call did not arrive, or not as they were sent: that of the lamp, and one with a hashed field."""
+"""Shows why two messages of the call did not arrive, or arrived changed: that of the lamp, and one with a hashed field."""
 import json
 import subprocess
 

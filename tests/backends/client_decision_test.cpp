@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The borders of the decision on a client entry and of its filters; the rest of the tables is
-// played by real processes.
+// The edge cases of the decision on a client entry and of its filters; tests with real processes cover the
+// rest.
 #include "backends/https/client_decision.h"
 
 #include <gtest/gtest.h>

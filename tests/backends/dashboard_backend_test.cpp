@@ -25,7 +25,7 @@ using Level = platform::LogLevel;
 const std::string kDevice = "00112233445566778899aabbccddeeff00112233";
 constexpr platform::TimeValue kTime{1'400'000'000, 123'456};
 
-// A dashboard on loopback. Whoever waits for a datagram in vain gets none after 10 s.
+// A dashboard on loopback. A wait for a datagram ends without one after 10 s.
 struct DashboardServer {
   DashboardServer() : socket(::socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
     auto address = *backends::parseIPv4Address("127.0.0.1", 0);

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What becomes of a dashboard datagram after its first transmission, on ticks and a time that the test sets.
+// The delivery of a dashboard datagram after its first transmission, with ticks and a time that the test
+// sets.
 #include <gtest/gtest.h>
 
 #include <set>
@@ -15,8 +16,8 @@ namespace {
 using namespace std::chrono_literals;
 using Verdict = backends::DeliverySchedule::Verdict;
 
-// A network that takes datagrams on some ticks only; the first transmission is tick 0. On others they may not
-// leave.
+// A network that accepts datagrams on some ticks; the first transmission is tick 0. On other ticks they may
+// not leave.
 struct Network {
   explicit Network(std::set<int> closedAt, std::set<int> forbiddenAt = {})
       : closed(std::move(closedAt)), forbidden(std::move(forbiddenAt)) {}

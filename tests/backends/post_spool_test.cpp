@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The spool and its sender over a real folder: what becomes of posts when something is short, a fetch hangs,
-// the disk refuses, or the owner withdraws.
+// The spool and its sender over a real folder: shortages, a fetch that hangs, disk errors, and a withdrawal
+// of consent.
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -62,7 +62,7 @@ class StubbornDisk final : public platform::FileStore {
   }
   Result<platform::FileStamp, Failed> stamp(const std::string& path) override { return _disk.stamp(path); }
 
-  // Paths with this in them; empty: none.
+  // Makes paths that contain this text unreadable; an empty text makes none unreadable.
   void keepUnread(const std::string& part) { set(_unread, part); }
   void keepThere(const std::string& part) { set(_unremoved, part); }
   std::set<std::thread::id> removers;
@@ -119,7 +119,7 @@ class HeldHTTPClient final : public http::HTTPClient {
   int _noMemory = 0;
 };
 
-// Knows a section that lets "phone" leave without consent, once it may answer.
+// Provides a section that lets "phone" report without consent, as soon as it may answer.
 class HangingSections final : public backends::SectionSource {
  public:
   std::shared_ptr<const config::StorebagSection> sectionFor(std::int32_t, bool fetch) override {

@@ -14,7 +14,7 @@
 namespace veltrad {
 namespace {
 
-// The number comes from another implementation of HMAC.
+// The expected number was computed with another implementation of HMAC.
 TEST(SamplingFactors, AreADigestThatIsSpreadEvenlyOverDevices) {
   std::string secret;
   for (char c = 0; c < 32; ++c) secret.push_back(c);

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the spool decides: which ends of a post keep it, which may still leave, and when an address is tried.
+// The decisions of the spool: which results keep a post, which posts may still leave, and when an address is
+// tried.
 #include <gtest/gtest.h>
 #include <malloc.h>
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What real processes do not show of uploads: how far a file is read that changes meanwhile, and who gets the
-// next place.
+// Parts of uploads that real processes do not show: how far a changing file is read, and who gets the next
+// place.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <unistd.h>
@@ -50,7 +50,7 @@ TEST(FileSnapshot, EndsWhereTheFileEndedAtFirst) {
   EXPECT_EQ(emptied->content(), backends::FileSnapshot::Content::none);
 }
 
-// Asked by each who waits, after he has taken his place in the row.
+// Called by each waiting upload after it has joined the queue.
 struct Stoppable final : http::HTTPClient {
   Result<Done, http::HTTPError> start(http::HTTPRequest, http::HTTPCompletion) override { return Done(); }
   http::HTTPResult perform(http::HTTPRequest) override { return Failure{http::HTTPError{}}; }
@@ -62,7 +62,7 @@ struct Stoppable final : http::HTTPClient {
   std::atomic<bool> stop{false};
 };
 
-// Who waits is let in by order of arrival, but for the share of his user; a stop ends every wait.
+// Waiting uploads get places in order of arrival, within the share of each user; a stop ends every wait.
 TEST(FileUploads, OneUserLeavesAPlaceToOthers) {
   backends::FileUploads uploads;
   Stoppable http;

@@ -22,7 +22,7 @@ struct Trailer {
   std::uint64_t top = 0;
 };
 
-// `change` may bend the trailer after it was filled in.
+// `change` may modify the finished trailer.
 template <typename Change>
 std::string binaryList(const std::vector<std::string>& objects, Change change) {
   std::string bytes = "bplist00";

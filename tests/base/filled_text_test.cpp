@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Texts with numbers in them, compared with the library that writes them elsewhere.
+// Formatted texts with numbers, compared with the fmt library.
 #include "base/filled_text.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The order of locks as it is checked at run time, in debug builds alone.
+// The run-time check of the lock order, in debug builds only.
 #include "base/mutex.h"
 
 #include <gtest/gtest.h>

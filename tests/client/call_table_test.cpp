@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Calls under way: which of them an answer, an event or the end of the connection reaches.
+// Open calls: which of them an answer, an event or the end of the connection ends.
 #include "client/call_table.h"
 
 #include <gmock/gmock.h>

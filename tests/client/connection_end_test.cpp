@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What becomes of calls when the daemon does not read, goes away, or the session is closed.
+// Calls when the daemon does not read or ends, or when the session is closed.
 #include "harness.h"
 
 namespace veltrad::client_test {

@@ -58,7 +58,7 @@ TEST(Options, OfALiveSessionCanBeGivenAnew) {
 TEST(Options, OfAProgramThatWasBuiltWith80KeepTheirMeaning) {
   constexpr std::size_t kEnd = offsetof(veltra_session_options, undescribed) + sizeof(bool);
   constexpr std::size_t kSize = (kEnd + 7) / 8 * 8;
-  // Its struct ends here; the rest is somebody else's.
+  // The struct of 8.0 ends here; the rest belongs to other data.
   union {
     veltra_session_options options;
     unsigned char bytes[sizeof(veltra_session_options)];

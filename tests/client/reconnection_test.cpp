@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// When the next connection is tried, and what is known of the calls of the last one.
+// The time of the next attempt to connect, and which calls of the last connection are known to have been run.
 #include "client/reconnection.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Values of the C interface: what may be put into what, and who lets it go.
+// Values of the C interface: nesting rules and ownership.
 #include <gtest/gtest.h>
 
 #include "veltra/veltra.hpp"

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A daemon's configuration in memory, beside a storebag server that answers as the test says, and its log.
+// A daemon's configuration in memory, a storebag server that answers as the test says, and a log.
 #pragma once
 
 #include <string>

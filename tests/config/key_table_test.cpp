@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Every key of a storebag, by the tables themselves: what is read of a value of its type, of another type and
-// beyond its range.
+// Every key of the storebag tables: how values of its type, of another type and beyond its range are read.
 #include "config/key_table.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The owner's policy: each verdict, what breaks the file, and what becomes of fields.
+// The owner's policy: each verdict, broken files, and the treatment of fields.
 #include "config/owner_policy.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the storebag server comes from, and what is not known during a shortage.
+// The address of the storebag server, and settings that are unknown during a shortage.
 #include "config/process_settings.h"
 
 #include <gtest/gtest.h>

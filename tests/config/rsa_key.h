@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A key of the test's own, able to sign as it should be done and in every way that it should not.
+// A test key that can make correct signatures and all kinds of wrong ones.
 #pragma once
 
 #include <gtest/gtest.h>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The download of a storebag and the choice of its section: what is asked, what each answer leads to, and
-// what it says in the log.
+// The download of a storebag and the choice of its section: the request, the result of each answer, and the
+// log lines.
 #include "config/storebag_download.h"
 
 #include <gtest/gtest.h>
@@ -112,7 +112,7 @@ TEST(StorebagDownload, RefusesWhatIsNotSignedAsItShould) {
   }
 }
 
-// Hostile lists are the codecs' tests; here it is that these bounds are the ones in force.
+// The tests of the codecs cover hostile lists; this test checks that these bounds apply.
 TEST(StorebagContainer, IsReadWithinItsOwnBounds) {
   Value deep(1);
   for (int i = 0; i < 9; ++i) deep = Array{deep};
@@ -177,7 +177,7 @@ TEST(StorebagSections, LetTheStorebagCapItsOwnLifetime) {
     const Lines line{"6 " + kChoosing + "Store bag override MaxAge=" + std::to_string(seconds)};
     EXPECT_EQ(Choice(4, Dictionary{{"release", kR}, {"refresh_cycle", cycle}}, line).maxAge, seconds);
   }
-  // Nothing but the storebag's own word is capped, and a text is no word.
+  // Only the storebag's own value is capped, and a text does not count as a value.
   EXPECT_EQ(Choice(4, Dictionary{{"release", kR}, {"refresh_cycle", "3600"}}, {}, "max-age=100000").maxAge,
             100'000);
 }

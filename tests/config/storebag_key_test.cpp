@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What counts as a signature, and what counts as a key: everything that comes close must not.
+// Which signatures and keys are accepted, and that near misses are refused.
 #include "config/storebag_key.h"
 
 #include <gtest/gtest.h>
@@ -85,7 +85,7 @@ std::string der(char tag, const std::string& content) {
   const auto high = static_cast<char>(content.size() >> 8), low = static_cast<char>(content.size());
   return tag + (content.size() < 128 ? ""s : "\x82"s + high) + low + content;
 }
-// RSAPublicKey with a modulus of so many bits; nobody has the other half.
+// RSAPublicKey with a modulus of so many bits, without a private key.
 std::string keyOf(int bits, const std::string& exponent = "\x01\x00\x01"s) {
   std::string modulus(static_cast<std::size_t>(bits + 7) / 8, '\x5b');
   modulus[0] = static_cast<char>(1 << (bits - 1) % 8);

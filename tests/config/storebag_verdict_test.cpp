@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which storebags are taken: dates, the operator's rules, and what is remembered of earlier ones.
+// Which storebags are accepted: dates, the operator's rules, and the record of earlier ones.
 #include "config/storebag_verdict.h"
 
 #include <gtest/gtest.h>
@@ -60,7 +60,7 @@ constexpr double kNow = 1'795'700'000;  // within 2026-11-26
 const std::string kRSA(64, 'a'), kFirst(64, 'b'), kSecond(64, 'c');
 const config::StorebagRules kAll{true, true, true, true, true};
 
-// What a bag with all that the rules ask for says, with one thing changed.
+// A bag that satisfies all rules, with the given changes.
 Dictionary saying(const Dictionary& other = {}) {
   Dictionary bag{{"release", Dictionary()}, {"name", "quindle"}, {"serial", 5}, {"expires", "2026-11-26"}};
   bag.merge(other);
@@ -135,7 +135,7 @@ TEST(StorebagVerdict, NamesTheRuleThatABagBreaks) {
     const auto refusal = refusalOf(c.bag, c.signers, c.seen, kAll);
     EXPECT_EQ(refusal ? std::optional(refusal->reason) : std::nullopt, c.reason);
     EXPECT_EQ(refusal ? refusal->text : "", c.text);
-    // Without the rules nothing of it is looked at.
+    // Without the rules none of it is checked.
     EXPECT_FALSE(refusalOf(c.bag, c.signers, c.seen, {}));
   }
   Array many;
@@ -222,7 +222,7 @@ TEST(StorebagTrust, RemembersOverARestartAndVouchesForNothingOnceThatIsTorn) {
   device.files.failReads(path, {});
   device.files.put(path, whole);
   device.files.failWrites(FakeFileStore::Kind::noSpace);
-  // What cannot be written holds for this process, and is written with the next accepted one.
+  // A record that cannot be written applies in this process, and is written with the next accepted bag.
   EXPECT_EQ(restarted([&](auto& trust) {
               EXPECT_EQ(refusal(trust, 7), std::nullopt);
               EXPECT_EQ(*device.files.bytes(path), whole);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The verdicts of `veltractl doctor` that no broken set-up in tests/e2e/test_doctor.py brings about.
+// The results of `veltractl doctor` that tests/e2e/test_doctor.py does not cover.
 #include "daemon/diagnosis.h"
 
 #include <gtest/gtest.h>

@@ -66,7 +66,7 @@ struct Session {
       if (sign == '-') lacks = true;
       if (sign == '!') aggregation->setActive(true);
     }
-    // Levels come from the first; the second is the one whose state is looked at.
+    // The first back end gives the level; the state of the second one is checked.
     const auto leading = std::make_shared<Reporting>("leading", random);
     leading->setHierarchy(level);
     set->emplace(wire::kVeltraBackendHTTPPost, leading);
@@ -124,7 +124,7 @@ class World {
     for (const auto& session : _sessions) all += (all.empty() ? "" : " ") + session->look();
     return all;
   }
-  // Whose client gets it.
+  // Returns the session whose client gets the copy.
   std::string copyOf(const Session& sender) {
     if (families.ancestorAggregates(sender.place()) !=
         families.sendToAncestor(sender.place(), "copy").taken) {

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The storebag cache: what it downloads, when, and what a failure leaves.
+// The storebag cache: what it downloads and when, and its state after a failure.
 #include "daemon/storebag_cache.h"
 
 #include <gtest/gtest.h>
@@ -198,7 +198,7 @@ TEST_F(Cache, AFetchThatLackedMemoryIsOverForThoseWhoWait) {
   EXPECT_NE(second, nullptr);
 }
 
-// What a storebag's age says a moment after it was fetched, or failed.
+// The verdict on a storebag's age just after a fetch or a failure.
 TEST(StorebagAge, AgeAndOutcomeDecide) {
   using enum daemon::CacheVerdict;
   struct Case {
@@ -225,7 +225,7 @@ TEST(StorebagAge, AgeAndOutcomeDecide) {
   }
 }
 
-// What comes between two attempts, by how they ended: told 0 means that there was no answer.
+// The wait between two attempts, by their results; a max age of 0 means that there was no answer.
 TEST(StorebagAge, JitterSpreadsTheWaits) {
   struct Attempt {
     bool successful;

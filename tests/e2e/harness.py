@@ -316,7 +316,7 @@ class Ctl(Process):
 
 
 class Wire:
-    """A client on the bare socket that writes frames as in docs/wire-protocol.md, valid or not."""
+    """A client on the bare socket that writes frames (docs/wire-protocol.md), valid or not."""
     HELLO, CALL, REPLY, EVENT, REFUSAL, LARGE_CALL = range(1, 7)
 
     def __init__(self, root, hello=True):

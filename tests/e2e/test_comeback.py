@@ -1,6 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Clients whose daemon is restarted, killed or stopped while they send: nothing arrives twice, and what did not arrive is
-counted."""
+"""Clients whose daemon is restarted, killed or stopped while they send: nothing arrives twice, and every loss is counted."""
 import collections
 import json
 import os
@@ -24,7 +23,7 @@ class Sender(Process):
         self.wait_for(lambda lines: lines, "the sender's first messages")
 
     def finish(self):
-        """Ends its input; returns what it says about its messages."""
+        """Ends the input of the sender; returns its report about its messages."""
         self.popen.stdin.close()
         assert self.end() == 0
         return json.loads(self.text[-1])
@@ -40,7 +39,7 @@ def arrived(lab):
 
 
 class Ledger:
-    """What daemons that ran under a root, one after the other, say that they have lost."""
+    """The losses that the successive daemons under a root have counted."""
 
     def __init__(self, root):
         self.path, self.by_process = root.path / "run/veltrad/counters.json", {}
@@ -87,7 +86,7 @@ class Comeback(SystemTest):
         self.ledger.add()
 
     def check(self, said, exactly=True):
-        """Compares what has arrived with what the senders and the daemons say."""
+        """Compares the arrivals with the reports of the senders and the daemons."""
         counts, counted = arrived(self.lab), self.ledger.total()
         for one in said:
             numbers = counts[one["sender"]]

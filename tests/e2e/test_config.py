@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""veltractl config, refresh and report: what is changed, fetched and passed on."""
+"""veltractl config, refresh and report: changed preferences, fetched storebags, reports."""
 import fcntl
 import json
 import os
@@ -76,7 +76,7 @@ class Configuration(SystemTest):
         self.root.prefer(another="stays")
         with self.serving():
             self.every_key()
-            # A daemon that does not answer is not gone.
+            # A daemon that does not answer still holds the lock.
             (self.root.path / "run/veltrad/control.sock").unlink()
             self.assertIn("does not answer", self.ctl("config", "set", "environmentType", "1", status=1)[1])
             self.assertEqual(self.stored("environmentType"), 4)

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""The control socket: what those who look after the device are told."""
+"""The control socket: the answers for administrators."""
 import json
 import os
 import subprocess

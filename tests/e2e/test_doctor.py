@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""veltractl doctor: set-ups that are broken in one place each, the check that finds it and what it says to do."""
+"""veltractl doctor: set-ups with one fault each, the check that finds it, and its advice."""
 import json
 import os
 import pathlib
@@ -15,13 +15,13 @@ ON_THE_WAY = NAMES[3:8]
 OBSERVE, NOBODY = "com.florn.veltrad.observe", 65534
 RETIRED = "var/mobile/Library/Logs/Zentrel/Retired"
 PREFERENCES = {"environmentType": 4, "DiagnosticLogSubmissionEnabled": True}
-# What the daemon logs about what is broken.
+# Log lines of the daemon about the faults.
 LOGGED = ("fetchStorebag", "Entitlements", "storebagServerURL", "userDefaults", "ca.pem", "certificate")
 
 
 class Doctor(SystemTest):
     def doctor(self, *arguments, **options):
-        """The checks by name; the exit status, "ok" and the form are what they say."""
+        """Returns the checks by name; verifies the exit status, "ok" and the form."""
         veltractl = self.root.copy_of("veltractl") if "user" in options else program("veltractl")
         done = subprocess.run([veltractl, "doctor", "--json", *arguments], capture_output=True, text=True,
                               env=self.root.environment(), timeout=DEADLINE, **options)

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What README.md and examples/ show is compiled from there, and does what they say."""
+"""Compiles the code of README.md and examples/ and checks its behaviour."""
 import os
 import re
 import shutil

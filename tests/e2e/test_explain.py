@@ -1,8 +1,8 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What `veltra-storebag explain` says equals what the daemon does with the same storebag, device, consent and draw.
+"""`veltra-storebag explain` agrees with the daemon for the same storebag, device, consent and sampling factor.
 
-Random storebags are tried for a minute. VELTRA_BAGS says how many instead, VELTRA_SESSIONS how many sessions each is tried
-with, VELTRA_SEED which; a difference names the number of its storebag, and VELTRA_FIRST begins there."""
+Tries random storebags for a minute. VELTRA_BAGS gives their number instead, VELTRA_SESSIONS the number of sessions for each,
+VELTRA_SEED the seed. A difference names the number of its storebag; VELTRA_FIRST begins with this number."""
 import base64
 import concurrent.futures
 import contextlib
@@ -47,7 +47,7 @@ def kept(dictionary):
 
 
 class Group:
-    """What several storebags have in common: a daemon reads some of it once."""
+    """The settings that several storebags share, because a daemon reads them only once."""
 
     def __init__(self, number):
         dice = random.Random(f"{SEED} group {number}")
@@ -343,7 +343,7 @@ class ExplainedAndCompared(unittest.TestCase):
         return made
 
     def leaving(self, told):
-        """What leaves, by message: to which host, and which fields in clear."""
+        """The data that leaves, by message: the host, and the fields in clear."""
         return {(name, event["_eventNumber"], url.split("/")[2].split(":")[0], field)
                 for name, of in told["backends"].items() for event in of["events"]
                 for url in [of["url"] or of["realtimeUrl"]] for field in [*event, None]

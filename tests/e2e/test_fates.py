@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What `veltractl why` and `watch` tell, compared with what the servers and logs have seen of each message.
+"""Compares the output of `veltractl why` and `watch` with what servers and logs have seen of each message.
 
-VELTRA_FATES says how many random messages there are (300), VELTRA_SEED which."""
+VELTRA_FATES is the number of random messages (300), VELTRA_SEED the seed."""
 import json
 import os
 import plistlib
@@ -368,7 +368,7 @@ class RandomFates(FatesTest):
             client.flush()
 
     def settled(self):
-        """Nothing is under way any more."""
+        """True if nothing is open any more."""
         return not any(backend["fate"] == "waiting" or backend["fate"] == "posted" and backend["status"] is None
                        for line in self.why("--last", "1000000") for backend in line["backends"].values())
 

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What the owner of the device is told: the receipt of turning off, identifiers, and the history of what left."""
+"""The owner's commands: the receipt of turning reporting off, identifiers, and the history."""
 import contextlib
 import http.server
 import json

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What the owner of the device says in policy.json, on open sessions and before anything leaves."""
+"""The owner's policy in policy.json, for open sessions and before anything leaves."""
 import hmac
 import json
 import os

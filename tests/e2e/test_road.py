@@ -104,7 +104,7 @@ class Ctl(SystemTest):
             daemon.wait_for_line("was invalidated", 3)
 
     def test_what_became_of_a_message(self):
-        """The answer to a send says what each back end did with it, and why."""
+        """The answer to a send shows the outcome in each back end, and the reason."""
         identity = ["--client-type", "7", "--client", "phone", "--require-user-info"]
         others = {"dashboard": {"ip": "127.0.0.1", "port": self.lab.dashboard[1], "reliable": 100}, "ampery": {},
                   "uploadserver": {"post_url": "${url}/upload"}}

@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Storebags that are rolled out with care: docs/rollout.md as it stands, attacks on a daemon with all settings on, what a
-device remembers, and open sessions that follow their storebag."""
+"""The rules for storebags: all commands of docs/rollout.md, attacks on a daemon with all settings on, the record of seen
+storebags, and open sessions that follow their storebag."""
 import json
 import os
 import pathlib
@@ -122,7 +122,7 @@ class Attacks(Rollout):
                     self.assertEqual(name, check)
                     self.assertIn(words, advice)
                     (self.lab.path / "storebags" / NAME).unlink(missing_ok=True)
-            # The twelfth: a stolen key runs ahead, until the owner's storebag revokes it.
+            # The twelfth attack: a stolen key uses a very high serial, until the owner's storebag revokes the key.
             self.fetched(serial=2**53 - 1, key="stolen", ed25519=["stolen"])
             self.serve(serial=6)
             self.assertEqual(self.refresh()["reason"], f"serial 6 is lower than {2**53 - 1}")
@@ -130,7 +130,7 @@ class Attacks(Rollout):
             self.serve(serial=7, key="stolen", ed25519=["stolen"])
             self.assertRegex(self.refresh()["reason"], "^key [0-9a-f]{16} is revoked$")
             self.assertIn("not revoked", self.advice()[0][1])
-            # All the while the last good one serves.
+            # Meanwhile the last good one stays in use.
             self.assertEqual(self.open(TYPE)[1], ["httppost"])
             shown = json.loads(self.ctl("status", "--json")[0])["storebags"]
             self.assertRegex(next(one["refusal"] for one in shown if one["name"] == NAME), "is revoked")
@@ -168,7 +168,7 @@ class Memory(Rollout):
             self.assertIn(f"remove {seen}", advice)
             seen.unlink()
             self.assertEqual(self.refresh()["result"], "fetched")
-        # Without the settings nothing is looked at.
+        # Without the settings nothing is checked.
         (self.root.path / SETTINGS).unlink()
         before = seen.read_bytes()
         with self.serving():

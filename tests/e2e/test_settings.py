@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What an administrator says under etc/veltrad: both forms of a file, SIGHUP, settings.json."""
+"""The files under etc/veltrad: both forms, SIGHUP, settings.json."""
 import json
 import os
 import signal

@@ -106,7 +106,7 @@ class Shortage(SystemTest):
             client.close()
 
     def test_entitlements_during_a_shortage(self):
-        """However far a connection gets during the shortage, the next one finds the current rules."""
+        """However far a connection gets during the shortage, the next connection uses the current rules."""
         with self.serving("A connection could not be accepted", "Entitlements could not be read just now") as daemon:
             self.assertIsNone(self.refusal())
             for more in range(7):

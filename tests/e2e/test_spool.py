@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Posts that fail are kept and sent again: over faults of servers and disks, restarts and kills, under the owner's word.
+"""Posts that fail are kept and sent again: despite faults of servers and disks, restarts and kills, within the owner's policy.
 
-VELTRA_ROUNDS says how often the daemon is killed (10)."""
+VELTRA_ROUNDS is the number of times that the daemon is killed (10)."""
 import collections
 import contextlib
 import json

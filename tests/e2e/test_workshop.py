@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""veltra-storebag as whoever writes a storebag uses it: files, standard input, exit statuses, an editor's schema."""
+"""veltra-storebag for writing storebags: files, standard input, exit statuses, an editor's schema."""
 import functools
 import json
 import os

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A session behind the ipc room that answers each call in some way of its kind. The connection's own thread.
+// A session for tests of the room ipc that answers every call. The connection's own thread.
 #pragma once
 
 #include "wire/client_session_interface.h"

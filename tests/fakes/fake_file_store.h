@@ -59,7 +59,7 @@ class FakeFileStore final : public platform::FileStore {
     return file ? platform::FileStamp(file->stamp) : platform::FileStamp();
   }
 
-  // What somebody else does to the disk; never fails.
+  // A change by another process; never fails.
   void put(const std::string& path, std::string_view bytes) {
     std::lock_guard lock(_mutex);
     _files[path] = {std::string(bytes), 0644, ++_lastStamp};
@@ -79,7 +79,7 @@ class FakeFileStore final : public platform::FileStore {
   }
   int replaced() const { return _replaced; }
 
-  // From now on; nothing: all is well again. While no other thread uses it.
+  // Makes writes fail from now on; absent: they succeed again. To be called while no other thread uses it.
   void failWrites(std::optional<Kind> kind) { _writeFailure = kind; }
   void failReads(const std::string& path, std::optional<Kind> kind) {
     _readFailures.erase(path);

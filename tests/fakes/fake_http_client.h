@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The HTTP client's twin: answers what waits by a function; nobody may post. Any thread.
+// A fake HTTP client: a function answers blocking requests; posts are not allowed. Any thread.
 #pragma once
 
 #include <gtest/gtest.h>

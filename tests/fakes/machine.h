@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a machine says of itself, as the test sets it: time, locale, draws, device, preferences. Any thread,
-// but the locale and the draw are set before threads start.
+// The properties of a machine as the test sets them: time, locale, random numbers, device, preferences. Any
+// thread; locale and random numbers must be set before threads start.
 #pragma once
 
 #include <atomic>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The log of one test, kept: an unexpected warning or error fails the test. One at a time; lines from any
-// thread.
+// Records the log of one test: an unexpected warning or error fails the test. One object at a time; lines
+// from any thread.
 #pragma once
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Stands before the allocator of the C library.
+// Replaces the allocator of the C library.
 #include "fakes/scarce_memory.h"
 
 #include <cerrno>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A bare end of the wire protocol, for the tests of either side of it, and what their threads wait for.
+// One end of the wire protocol on a bare socket, for tests of both sides, and helpers for their threads.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -58,7 +58,7 @@ class Journal {
   std::vector<std::string> _lines;
 };
 
-// What one thread waits at until another opens it.
+// Blocks threads until another thread opens it.
 class Gate {
  public:
   void open() { _journal.add("open"); }

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Every service's twin in one place, and the real objects that stand on them, for tests of back ends and
-// above.
+// All fake services, and the real objects that use them, for tests of back ends and above.
 #pragma once
 
 #include "backends/standalone_services.h"

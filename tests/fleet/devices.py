@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What devices send, and a fleet to send it to."""
+"""Devices' requests and datagrams, and a fleet to send them to."""
 import gzip
 import http.client
 import json
@@ -34,7 +34,7 @@ class Answer:
 
 
 class Door:
-    """A connection to a gateway, or through nginx, that is made anew when it is lost."""
+    """A connection to a gateway, or through nginx, that is made again when it is lost."""
 
     def __init__(self, address, tls=None, timeout=45):
         self.address, self.tls, self.timeout, self.connection = address, tls, timeout, None
@@ -73,7 +73,7 @@ class Dashboard:
         self.socket.connect((host, int(port)))  # an answer from elsewhere is not received
 
     def ask(self, packet, wait=5):
-        """The acknowledgement, or nothing."""
+        """Returns the acknowledgement, or None."""
         self.socket.settimeout(wait)
         self.socket.send(packet)
         try:
@@ -111,7 +111,7 @@ class FleetTest(unittest.TestCase):
         """Before the parts start."""
 
     def say(self, user, *lines, server="stream1"):
-        """Says something to a server of the stream in its own protocol; what it says until it has read that."""
+        """Sends something to a server of the stream in its own protocol; returns the answers until the server has read it."""
         name, password = self.fleet.secret(user).read_text().strip().split(":") if user else ("", "")
         words = {"verbose": False, "headers": True, **({"user": name, "pass": password} if user else {})}
         with socket.create_connection(("127.0.0.1", self.fleet.facts["streams"][server][0]), 10) as link:
@@ -135,7 +135,7 @@ class FleetTest(unittest.TestCase):
         return door
 
     def rows(self, sql, count):
-        """The rows of the query when it has so many."""
+        """Waits until the query has so many rows, and returns them."""
         return side.wait_until(lambda: (found := self.fleet.query(sql)) and len(found) >= count and found, f"{count} rows of {sql}", 20)
 
 

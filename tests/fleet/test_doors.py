@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What gateways take and refuse, and that it is in the tables as it came."""
+"""The requests that gateways accept and refuse; accepted data is unchanged in the tables."""
 import contextlib
 import gzip
 import hashlib

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What the drain makes of messages that no gateway has put into the stream, and of a database or a stream that is not as usual."""
+"""The drain with messages that no gateway has published, and with faults of the database and the stream."""
 import http.client
 import os
 import pathlib

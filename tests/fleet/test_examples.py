@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""scripts/fleet as somebody who looks after a fleet uses it."""
+"""scripts/fleet as an administrator uses it."""
 import contextlib
 import itertools
 import json

@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Parts are killed in turn under load and come back. VELTRA_ROUNDS is how often; VELTRA_CLIENTS how many devices send."""
+"""Parts are killed in turn under load and come back. VELTRA_ROUNDS is the number of kills, VELTRA_CLIENTS that of devices."""
 import itertools
 import json
 import os

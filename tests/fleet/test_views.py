@@ -1,5 +1,5 @@
 # SPDX-License-Identifier: Apache-2.0
-"""What the views answer about rows that are known."""
+"""The results of the views for known rows."""
 import itertools
 import json
 import os

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// A day's file of the history as a kill, a full disk or another program may leave it. The reader walks within
-// it and ends, and what follows the last intact record is cut off for good. A record that is written with the
-// input as its body, and followed by the input, is read as it was.
+// A day's file of the history as a kill, a full disk or another program may leave it. The reader stays within
+// the file and ends, and everything after the last intact record is cut off for good. A record with the input
+// as its body, followed by the input, is read back unchanged.
 #include <sys/mman.h>
 #include <unistd.h>
 

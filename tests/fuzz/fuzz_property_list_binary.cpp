@@ -14,7 +14,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* bytes, std::size_t siz
   if (!read.ok()) return 0;
   // Written out, shared objects are each their own: no limit that counted them at each place is passed.
   fuzz::mustBe(read.value(), parseBinaryPropertyList(writeBinaryPropertyList(read.value())));
-  // XML has no word for all of it, but for every value a text that is read.
+  // XML cannot represent all of it, but it has a readable text for every value.
   PropertyListLimits wide;
   wide.textBytes *= 3;
   if (!formats::parseXMLPropertyList(formats::writeXMLPropertyList(read.value()), wide).ok()) std::abort();

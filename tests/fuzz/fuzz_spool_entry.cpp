@@ -9,7 +9,7 @@
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   using namespace veltrad;
   const std::string_view bytes(reinterpret_cast<const char*>(data), size);
-  // A checksum keeps most bytes from the reader of what it covers.
+  // The checksum rejects most inputs before the content is parsed.
   static_cast<void>(support::readSpoolEntry(bytes));
   if (const auto entry = support::readSpoolContent(bytes)) {
     const auto again = support::readSpoolEntry(support::writeSpoolEntry(*entry));

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Stands in for libFuzzer: gives each file of the corpus directories named on the command line to the fuzz
-// target. One thread.
+// Replaces libFuzzer: passes each file of the corpus directories on the command line to the fuzz target. One
+// thread.
 #include <cstdint>
 #include <cstdio>
 #include <filesystem>

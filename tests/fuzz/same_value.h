@@ -29,7 +29,7 @@ inline bool same(const Value& a, const Value& b) {
   return a == b;
 }
 
-// The end of the program unless what was written is read again as the same value.
+// Ends the program unless the written text is read back as the same value.
 template <typename Read>
 void mustBe(const Value& value, const Read& again) {
   if (!again.ok() || !same(value, again.value())) std::abort();

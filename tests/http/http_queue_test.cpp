@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The queue of requests that wait for a connection: what runs next.
+// The queue of waiting requests: which one runs next.
 #include "http/http_queue.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a call must hold, and what becomes of its reply.
+// The arguments that a call needs, and its reply.
 #include "harness.h"
 
 namespace veltrad::ipc_test {

@@ -90,7 +90,7 @@ TEST(Connection, TakesADescriptorWithItsFrameAndKeepsNone) {
   }
 }
 
-// A door whose messages of category 1 wait at a gate.
+// A listener whose messages of category 1 wait at a gate.
 struct GatedDoor : Door {
   GatedDoor() {
     onMessage = [this](std::uint16_t category, wire::SentReply reply) {

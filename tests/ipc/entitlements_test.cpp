@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Who a peer is, and what the rules let it do.
+// The identity of a peer, and the entitlements that the rules grant it.
 #include "ipc/entitlements.h"
 
 #include <gtest/gtest.h>

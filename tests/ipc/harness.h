@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A daemon's door with a recording session behind it, and clients at bare sockets before it.
+// A daemon's listener with recording sessions, and clients on bare sockets.
 #pragma once
 
 #include <gmock/gmock.h>
@@ -56,7 +56,7 @@ inline std::string helloFrame(Value wire = 1) {
                          Dictionary{{"library", "8.0"}, {"wire", std::move(wire)}});
 }
 
-// A door in a directory of its own that lets everybody in.
+// A listener in a temporary directory that accepts every client.
 class Door : public ipc::ListenerDelegate {
  public:
   explicit Door(std::size_t most = 4096, std::size_t mostOfOneUser = 1024, platform::MemoryBounds bounds = {})

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the device says of itself.
+// The properties of the device.
 #include <gmock/gmock.h>
 
 #include "fakes/fake_file_store.h"

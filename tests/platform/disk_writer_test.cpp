@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The thread that waits for the disk, so that nobody else does.
+// The disk writer's thread: order, bounds, and waiting.
 #include "platform/disk_writer.h"
 
 #include <gtest/gtest.h>

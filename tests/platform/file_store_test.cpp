@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Files on a real disk: what a fault leaves behind.
+// Files on a real disk, and their state after a fault.
 #include "platform/file_store.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The bounds of the accounts, who makes room for whom, and lines that are counted.
+// The bounds of the accounts, eviction, and limited log lines.
 #include "platform/memory_budget.h"
 
 #include <gtest/gtest.h>

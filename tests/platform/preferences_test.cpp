@@ -94,7 +94,7 @@ TEST_F(FilePreferencesTest, AShortageIsNoAnswer) {
     _files.runShort(false);
   }
   EXPECT_EQ(_preferences.text(kDomain, "id"), "stored");
-  // What it has changed to meanwhile is not known; consent that may have gone is none.
+  // The new content is unknown, and consent that may have been withdrawn does not count.
   put({{"id", "other"}});
   _files.runShort(true);
   EXPECT_EQ(_preferences.value(kDomain, "id"), std::nullopt);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which messages of the kernel tell of a route.
+// Which messages of the kernel announce a route.
 #include "platform/wake_watch.h"
 
 #include <gtest/gtest.h>

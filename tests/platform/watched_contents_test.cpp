@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What messages hold is kept for those who watch, within its bound, and for nobody else.
+// The contents of messages are kept only for watchers, and within the bound.
 #include "platform/watched_contents.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Flushes that wait for several back ends: which answer is the one, and that nobody is called under the lock.
+// Flushes that wait for several back ends: which answer counts, and that no completion is called under the
+// lock.
 #include "session/flush_counters.h"
 
 #include <gtest/gtest.h>

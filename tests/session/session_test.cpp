@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session does with another word of the owner and another storebag, also when it has ended or memory
-// is short.
+// How a session handles a new decision of the owner and a new storebag, also after its end or when memory is
+// short.
 #include <gtest/gtest.h>
 
 #include <new>

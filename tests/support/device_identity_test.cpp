@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What becomes of the device property service's answers.
+// The use of the device property service's answers.
 #include "support/device_identity.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a gzip stream that comes in pieces is found to be.
+// The results for gzip streams that arrive in pieces.
 #include "support/gunzip.h"
 
 #include <gtest/gtest.h>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The history of what left, on a real disk: whole over kills, within its bounds, and never without its
-// record.
+// The history on a real disk: intact after kills and within its bounds, with a record for every departure.
 #include "support/history.h"
 
 #include <fcntl.h>

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The diagnostic message log in a real directory: what is kept, what is deleted, what a fault leaves behind.
+// The diagnostic message log in a real directory: which files are kept or deleted, and the state after a
+// fault.
 #include "support/message_log.h"
 
 #include <fcntl.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The spool's files and the table of what lies there: whole or not at all, in order, and within its bounds.
+// The spool's files and its index: files are complete or absent, in order, and within the bounds.
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whose reads end by the kernel's word: real mounts are for tests/e2e/test_uploads.py, which can make them.
+// The kinds of file systems. tests/e2e/test_uploads.py tests real mounts, which it can make.
 #include "wire/file_origin.h"
 
 #include <fcntl.h>

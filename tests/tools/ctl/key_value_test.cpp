@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a word KEY=VALUE of veltractl's command line stands for.
+// The meaning of KEY=VALUE on veltractl's command line.
 #include <gtest/gtest.h>
 
 #include "formats/json.h"

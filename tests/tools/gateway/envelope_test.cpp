@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which envelopes are taken, and what the tables make of their events.
+// Which envelopes are accepted, and the columns of their events.
 #include "gateway/envelope.h"
 
 #include <gmock/gmock.h>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// When a held message is published, how long it is held, and for what there is room; and when the stream may
-// forget.
+// When a held message is published, how long it is held, and the bounds; and when the stream may be purged.
 #include "gateway/held_messages.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Bodies over real connections: what a slow, endless or large one may cost.
+// Bodies over real connections: the limits for slow, endless and large ones.
 #include "gateway/http_server.h"
 
 #include <arpa/inet.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Bodies in pieces become whole again, whatever is repeated; what is old goes, and nothing else.
+// Bodies in pieces are reassembled, even if pieces are repeated; only old files are removed.
 #include "gateway/piece_store.h"
 
 #include <gmock/gmock.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a request's head decides, and what a datagram becomes.
+// Routing by a request's head, and the conversion of datagrams.
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 

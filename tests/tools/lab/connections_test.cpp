@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whom connections trust, also while the process has no descriptor left.
+// The certificates that connections trust, also while the process has no descriptor left.
 #include "http/connections.h"
 
 #include <glob.h>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// docs/reference and the completions say what the programs say. VELTRA_WRITE=1 test_tools_reference writes
-// them.
+// docs/reference and the completions match the programs. VELTRA_WRITE=1 test_tools_reference writes them.
 #include "tools/reference/pages.h"
 
 #include <gtest/gtest.h>

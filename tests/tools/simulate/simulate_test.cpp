@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Small fleets of two thousand devices: what each incident does to the servers, and which setting spreads it.
+// Small fleets of two thousand devices: the load of each incident on the servers, and the settings that
+// spread it.
 #include <gtest/gtest.h>
 
 #include <algorithm>

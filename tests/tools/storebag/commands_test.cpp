@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// veltra-storebag's commands on real files: what it makes, the daemon's own code must take.
+// veltra-storebag's commands on real files: the daemon's own code must accept their output.
 #include "storebag/commands.h"
 
 #include <fcntl.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What lint says of typical mistakes, and where; and that it knows every key of the tables.
+// The findings of lint for typical mistakes, with their places; and that it knows every key of the tables.
 #include "storebag/lint.h"
 
 #include <fmt/format.h>
@@ -69,7 +69,7 @@ struct Mistake {
   const char* mend;
 };
 const Mistake kMistakes[] = {
-    // What people do.
+    // Typical mistakes.
     {"\"sampling_threshold\": 0.5", "¶\"sampling_treshold\": 0.5", "unknown-key", "\"sampling_threshold\""},
     {"\"release\": {", "¶\"relase\": {", "unknown-section", "\"release\""},
     {"\"refresh_cycle\": 60,", "\"refresh_cycle\": 60, ¶\"ampery\": {},", "unknown-section",
@@ -123,7 +123,7 @@ const Mistake kMistakes[] = {
     {"\"version\": \"1\"", "\"version\": \"1\", ¶\"serial\": 4", "sha1-alone", "ed25519"},
 };
 
-// What may be mistaken for a mistake.
+// Correct input that looks like a mistake.
 const std::pair<const char*, const char*> kRight[] = {
     {"", ""},
     {"\"phone,lamp\"", "\"Zürich,PHONE,lamp\", \"service\": \"a b,-\""},
