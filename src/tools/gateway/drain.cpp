@@ -8,6 +8,7 @@
 #include <ctime>
 
 #include "gateway/admin.h"
+#include "gateway/attempt.h"
 #include "gateway/metrics.h"
 #include "gateway/serve.h"
 #include "platform/limited_line.h"
@@ -109,15 +110,18 @@ void Drain::run() {
   platform::LimitedLine failures("failures");
   std::unique_ptr<StreamReader> looking;
   while (!stopping()) {
-    const std::string why = runOnce();
+    std::string why = "no memory";
+    attempt([&] { why = runOnce(); });
     _counts.active = false;
     if (why.empty()) continue;
     ++_counts.restarts;
-    if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
-    if (!looking || looking->isOver()) {
-      if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
-    }
-    if (looking) measure(*looking);
+    attempt([&] {
+      if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
+      if (!looking || looking->isOver()) {
+        if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
+      }
+      if (looking) measure(*looking);
+    });
     pause(kBetweenTries);
   }
 }
@@ -272,7 +276,7 @@ void Drain::keepHouse(StreamReader& reader, TableWriter& writer, std::int64_t re
 
 int drain(const Arguments& given) {
   blockStopSignals();
-  StreamOptions stream = streamOptions(given.stream);
+  StreamOptions stream = given.stream;
   stream.inbox = "_INBOX.veltra-drain";
   Drain carrying(std::move(stream), given.drain);
   const DrainCounts& counts = carrying.counts();

@@ -84,8 +84,6 @@ Result<Envelope, std::string> parseEnvelope(std::string text) {
                                kMostIdentifierBytes)};
   const Array* events = fields->array("events");
   if (!events) return Failure{std::string("\"events\" is no array")};
-  if (events->size() > kMostEvents)
-    return Failure{fmt::format("{} events, at most {} are taken", events->size(), kMostEvents)};
   const Value* postTime = fields->find("postTime");
   if (postTime && !postTime->isNumber()) return Failure{std::string("\"postTime\" is no number")};
   Envelope envelope{*clientID, {}};

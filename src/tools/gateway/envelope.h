@@ -12,11 +12,9 @@
 
 namespace veltrad::gateway {
 
-// What no column takes is refused at the door. In bytes.
+// What no column takes is refused at the router. In bytes.
 inline constexpr std::size_t kMostIdentifierBytes = 1'024;
 inline constexpr std::size_t kMostKeyBytes = 256;
-// A device posts at most 4,096 at once. A small gzip stream of empty events must not become millions of rows.
-inline constexpr std::size_t kMostEvents = 65'536;
 
 struct Envelope {
   std::string clientID;

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <fstream>
 
+#include "gateway/attempt.h"
 #include "platform/log.h"
 
 namespace veltrad::gateway {
@@ -79,8 +80,10 @@ struct NATSCallbacks {
   // Without it the library writes to standard error.
   static void failed(natsConnection*, natsSubscription*, natsStatus status, void* closure) {
     auto* self = static_cast<NATSConnection*>(closure);
-    if (const auto line = self->_faults.happened(std::string("stream: ") + natsStatus_GetText(status)))
-      logWarning("%s", line->c_str());
+    attempt([&] {
+      if (const auto line = self->_faults.happened(std::string("stream: ") + natsStatus_GetText(status)))
+        logWarning("%s", line->c_str());
+    });
   }
 };
 

@@ -37,7 +37,8 @@ struct StreamOptions {
 // Closes the connection when it is destroyed. Any thread.
 class NATSConnection {
  public:
-  // Does not wait for a server to be there. `reconnected` is called on a thread of the library.
+  // Does not wait for a server to be there. `reconnected`, which must not throw, is called on a thread of the
+  // library.
   static Result<std::unique_ptr<NATSConnection>, std::string> open(const StreamOptions& options,
                                                                    std::function<void()> reconnected);
   ~NATSConnection();

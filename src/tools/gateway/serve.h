@@ -5,7 +5,6 @@
 #include <string>
 
 #include "base/value.h"
-#include "gateway/nats_connection.h"
 #include "tools/gateway/options.h"
 
 namespace veltrad::gateway {
@@ -19,8 +18,6 @@ void awaitStop();
 std::string asURL(const std::string& address);
 // One JSON line on standard output, and the word to the service manager.
 void sayReady(const Dictionary& line);
-
-StreamOptions streamOptions(const StreamArguments& given);
 
 // Both return the exit status, and have said on standard error why it is not 0.
 int serve(const Arguments& given);

@@ -55,18 +55,19 @@ class TableWriter {
   // What the stream takes next gets places behind `seq`, which is lower than the position.
   Result<Done, StoreError> goBack(std::uint64_t seq);
   // After an error nothing is written, unless the error came with the commit: ask for the position then.
-  Result<Written, StoreError> write(const std::vector<Taken>& messages);
+  Result<Written, StoreError> write(const std::vector<StreamMessage>& messages);
   // Forgets what is older: IDs of posts, and everything else unless `keepDays` is 0.
   Result<Done, StoreError> forget(double postDays, double keepDays);
 
  private:
-  Result<Written, StoreError> writeHalves(const Taken* begin, const Taken* end);
+  Result<Written, StoreError> writeHalves(const StreamMessage* begin, const StreamMessage* end);
   // With a refusal the messages go to "refused" for this reason.
-  Result<Written, StoreError> writeTogether(const Taken* begin, const Taken* end, const std::string& refusal);
-  Result<Batch, StoreError> batchOf(const Taken* begin, const Taken* end, std::set<std::string> seen,
-                                    const std::string& refusal);
-  Result<Done, StoreError> add(const Taken& message, TableRows& rows);
-  Result<std::set<std::string>, StoreError> knownPosts(const Taken* begin, const Taken* end);
+  Result<Written, StoreError> writeTogether(const StreamMessage* begin, const StreamMessage* end,
+                                            const std::string& refusal);
+  Result<Batch, StoreError> batchOf(const StreamMessage* begin, const StreamMessage* end,
+                                    std::set<std::string> seen, const std::string& refusal);
+  Result<Done, StoreError> add(const StreamMessage& message, TableRows& rows);
+  Result<std::set<std::string>, StoreError> knownPosts(const StreamMessage* begin, const StreamMessage* end);
   Result<Done, StoreError> copyRows(const TableRows& rows);
   Result<Done, StoreError> advance(Position to);
   Result<Done, StoreError> forgetNow(double postDays, double keepDays);
