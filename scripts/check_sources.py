@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Checks license, format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
-place; the exit status is 1 if there is any."""
+"""Checks license, format, include ladder, sizes of files and functions, code that must not compile, and clang-tidy. Prints each
+problem with its place; the exit status is 1 if there is any."""
 import collections
 import concurrent.futures
 import json
@@ -19,6 +19,7 @@ RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
 LONGEST_BODY = 380
 LONGEST_HEADER = 300
+LONGEST_FUNCTION = 50
 LARGEST_UNIT = 24
 LICENSE_LINE = "SPDX-License-Identifier: Apache-2.0"
 COMMENT_OF = {".cpp": ("//", ""), ".h": ("//", ""), ".hpp": ("//", ""), ".c": ("/*", " */"), ".py": ("#", ""),
@@ -91,13 +92,28 @@ def check_ladder():
     return found
 
 
+def long_functions(lines):
+    """The first lines of blocks that are too long, by the layout that clang-format gives them."""
+    for end, line in enumerate(lines):
+        indent = len(line) - 1
+        if line == " " * indent + "}":
+            begin = next(i for i in range(end - 1, -1, -1) if re.match(rf" {{{indent}}}[^ }}#/]", lines[i]))
+            if end - begin >= LONGEST_FUNCTION:
+                yield begin + 1, end - begin + 1
+
+
 def check_size():
     found = []
     for path in sources(".cpp", ".h", ".hpp"):
-        lines = len(path.read_text().splitlines()) - 1  # without that of the license
+        if path.relative_to(ROOT).parts[0] != "src":
+            continue
+        lines = path.read_text().splitlines()[1:]  # without that of the license
+        name = path.relative_to(ROOT)
         bound = LONGEST_BODY if path.suffix == ".cpp" else LONGEST_HEADER
-        if path.relative_to(ROOT).parts[0] == "src" and lines > bound:
-            found.append(f"{path.relative_to(ROOT)}: {lines} lines, more than {bound}; look for the second class in it")
+        if len(lines) > bound:
+            found.append(f"{name}: {len(lines)} lines, more than {bound}; look for the second class in it")
+        found += [f"{name}:{begin + 1}: a function of {length} lines, more than {LONGEST_FUNCTION}; divide it"
+                  for begin, length in long_functions(lines)]
     return found
 
 

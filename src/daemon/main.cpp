@@ -214,6 +214,66 @@ bool answerArguments(int count, char** arguments) {
   return false;
 }
 
+// What stands before the daemon is made.
+struct Prepared {
+  daemon::Services& services;
+  Sockets sockets;
+  platform::SandboxState sandbox;
+  std::optional<platform::CountsRecord>& countsRecord;
+  double started;
+};
+
+// Serves until a signal. Returns the exit status.
+int serveAndStop(Prepared prepared, platform::RunLoop& loop) {
+  daemon::Services& services = prepared.services;
+  services.writer.start();
+  const auto stateFile = [&services](platform::StateFile::State state, const std::string& path) {
+    return platform::StateFile(std::move(state), services.files, services.writer, path);
+  };
+  platform::StateFile countersFile =
+      stateFile(countersState(services.counters, prepared.started), services.root.countersPath());
+  platform::StateFile allowanceFile =
+      stateFile(allowanceState(services.allowance), services.root.allowancePath());
+  platform::StateFile destinationsFile =
+      stateFile(destinationsState(services.destinations), services.root.destinationsPath());
+  services.history.mend();
+  services.allowance.load();
+  services.destinations.load();
+  services.gate.refresh();
+  daemon::Daemon daemon(services);
+  ipc::Listener listener({std::move(prepared.sockets.service), services.entitlements, services.lentFiles,
+                          services.counters, services.memory, services.root.entitlementsPath()},
+                         daemon.agent());
+  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(prepared.sandbox));
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
+                              daemon.spool(), prepared.started);
+  ipc::Listener control({std::move(prepared.sockets.control), services.entitlements, services.lentFiles,
+                         services.counters, services.observersMemory, services.root.entitlementsPath(),
+                         kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
+                        observers);
+  platform::StateFile metricsFile = stateFile(metricsState(observers), services.root.metricsPath());
+  daemon.startSpool();
+  if (!listener.resume() || !control.resume()) {
+    services.http.failBlockingWaits();
+    daemon.stopSpool();
+    services.http.drain(std::chrono::steady_clock::now());
+    return 1;
+  }
+  platform::forbidExit();
+  services.serviceManager.ready();
+  logInfo("main: Listener resumes with sandbox, start loop.");
+  const daemon::StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
+  daemon::Housekeeping housekeeping(services, daemon, listener, files);
+  serve(housekeeping, loop);
+  const bool ended = stop(services, daemon, listener, control, files);
+  if (ended && prepared.countsRecord) prepared.countsRecord->told();
+  daemon.backends().sayRest();
+  platform::VeltraLogging::stopLogging();
+  if (!ended) _exit(0);
+  platform::allowExit();
+  return 0;
+}
+
 }  // namespace
 
 int main(int count, char** arguments) {
@@ -239,50 +299,6 @@ int main(int count, char** arguments) {
   }
   removeUnfinishedFiles(services.root);
   keepCounts(services, countsRecord, started);
-
-  services.writer.start();
-  platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
-                                   services.root.countersPath());
-  platform::StateFile allowanceFile(allowanceState(services.allowance), services.files, services.writer,
-                                    services.root.allowancePath());
-  platform::StateFile destinationsFile(destinationsState(services.destinations), services.files,
-                                       services.writer, services.root.destinationsPath());
-  services.history.mend();
-  services.allowance.load();
-  services.destinations.load();
-  services.gate.refresh();
-  daemon::Daemon daemon(services);
-  ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
-                          services.counters, services.memory, services.root.entitlementsPath()},
-                         daemon.agent());
-  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
-  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
-                              daemon.spool(), started);
-  ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
-                         services.counters, services.observersMemory, services.root.entitlementsPath(),
-                         kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
-                        observers);
-  platform::StateFile metricsFile(metricsState(observers), services.files, services.writer,
-                                  services.root.metricsPath());
-  daemon.startSpool();
-  if (!listener.resume() || !control.resume()) {
-    services.http.failBlockingWaits();
-    daemon.stopSpool();
-    services.http.drain(std::chrono::steady_clock::now());
-    return 1;
-  }
-  platform::forbidExit();
-  services.serviceManager.ready();
-  logInfo("main: Listener resumes with sandbox, start loop.");
-  const daemon::StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
-  daemon::Housekeeping housekeeping(services, daemon, listener, files);
-  serve(housekeeping, loop);
-
-  const bool ended = stop(services, daemon, listener, control, files);
-  if (ended && countsRecord) countsRecord->told();
-  daemon.backends().sayRest();
-  platform::VeltraLogging::stopLogging();
-  if (!ended) _exit(0);
-  platform::allowExit();
-  return 0;
+  return serveAndStop({services, std::move(sockets.value()), std::move(sandbox), countsRecord, started},
+                      loop);
 }

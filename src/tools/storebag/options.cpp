@@ -83,7 +83,9 @@ void describeKeys(CLI::App& app, Arguments& given) {
           "Public key whose Ed25519 signature must be there, too, in DER or PEM form");
   verify->add_option("FILE", given.file, "The container")->required();
   verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
+}
 
+void describeServing(CLI::App& app, Arguments& given) {
   CLI::App* publish = addCommand(
       app, "publish", "Put signed storebags where a web server serves them, each under its file's name");
   publish->positionals_at_end();  // the last one is DIR
@@ -240,6 +242,7 @@ void describe(CLI::App& app, Arguments& given) {
   app.set_version_flag("--version", std::string("veltra-storebag ") + kVersion, "Print the version");
   app.require_subcommand(1);
   describeKeys(app, given);
+  describeServing(app, given);
   describeWriting(app, given);
   describePlaying(app, given);
   app.footer(kFooter);  // last, because commands inherit it
