@@ -17,7 +17,7 @@ namespace {
 // Devices of this product type have no adaptor.
 [[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 
-// The one draw that a back end takes, decided before.
+// A random source that returns the sampling factor decided before.
 class FixedDraw final : public platform::Random {
  public:
   explicit FixedDraw(double draw) : _draw(draw) {}

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the record of fates says of how a back end stands. The session's thread.
+// Writes the state of a back end into the record of fates. The session's thread.
 #pragma once
 
 #include <cstdint>
@@ -8,8 +8,8 @@
 
 namespace veltrad::backends {
 
-// One entry serves many messages, until the back end stands otherwise, or the entry is so old that it would
-// be overwritten before those that refer to it.
+// One entry serves many messages, until the back end's state changes, or until the entry is so old that it
+// would be overwritten before the entries that refer to it.
 class StandingRecord {
  public:
   wire::FateRef of(const platform::FatePen& pen, const wire::StandingEntry& now) {

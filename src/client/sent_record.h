@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session has written, and what it has lost. Used under its connection's lock.
+// Records what a session has written and counts what it has lost. Used under its connection's lock.
 #pragma once
 
 #include <cstdint>
@@ -32,7 +32,7 @@ class SentRecord {
   void cut(const OutCall& call);
   // It was accepted but will not be written.
   void dropped(const OutCall& call) { _lost += call.counted; }
-  // What is not known to have been run is lost.
+  // Counts the calls as lost that are not known to have been run.
   void connectionEnded();
 
   WrittenCalls& calls() { return _calls; }
@@ -42,7 +42,7 @@ class SentRecord {
   // Calls that were written, on all connections.
   std::uint64_t sent() const { return _sent; }
   std::uint64_t lost() const { return _lost; }
-  // Of the lost calls, those that nobody was told of yet.
+  // Returns the number of lost calls since the last call of this function.
   std::uint64_t tellLost();
   std::uint64_t untold() const { return _lost - _told; }
 

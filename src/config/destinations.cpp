@@ -79,7 +79,7 @@ void Destinations::load() {
   forgetOld();
 }
 
-// Leaves those to which most bytes left.
+// Keeps the destinations with the most bytes.
 void Destinations::joinSmallest(ByAddress& sums) {
   if (sums.size() <= kMostShown) return;
   std::vector<ByAddress::const_iterator> order;

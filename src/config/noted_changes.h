@@ -10,7 +10,7 @@
 
 namespace veltrad::config {
 
-// Writes a few names at a time, the rest at the end of its life. Allocates nothing.
+// Writes a few names at a time, and the rest in the destructor. Allocates nothing.
 class NotedChanges final : public FieldChanges {
  public:
   // `about` names the message or the batch, and the time.
@@ -24,7 +24,7 @@ class NotedChanges final : public FieldChanges {
     note(change == FieldChange::removed ? wire::Step::removed : wire::Step::hashed, name);
   }
   void restored(std::string_view name) { note(wire::Step::restored, name); }
-  // Without the removed ones that stay hashed elsewhere in the message; null: nowhere.
+  // Omits removed fields that are hashed in `elsewhere`, another part of the message (may be null).
   void changed(const EditedFields& edits, const EditedFields* elsewhere = nullptr) {
     for (const std::string& name : edits.removed)
       if (!elsewhere || !elsewhere->hashed.contains(name)) note(wire::Step::removed, name);

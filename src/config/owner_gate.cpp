@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts the owner's word together. Any thread.
+// Computes the owner's decision. Any thread.
 #include "config/owner_gate.h"
 
 #include <algorithm>
@@ -15,7 +15,7 @@
 namespace veltrad::config {
 
 namespace {
-// Nothing: it cannot be read just now.
+// Absent if it cannot be read at the moment.
 std::optional<bool> isTrue(platform::Preferences& preferences, const char* key) {
   const auto found = preferences.lookUp(platform::kVeltraPreferenceDomain, key);
   if (!found) return std::nullopt;

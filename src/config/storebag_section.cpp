@@ -96,12 +96,13 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     return none;
   }
   const bool persist = choices->storebags.persist;
-  // What is to be kept must come whole once.
+  // A storebag that is to be kept must be downloaded completely once.
   const bool conditional = !persist || _store.holds(name);
   WholeStorebagAnswer whole =
       _download.fetchStorebagWithName(name, conditional ? lastModified : std::nullopt, *choices);
   StorebagSectionAnswer answer{whole, nullptr, {}};
-  // What was refused is not held, and may be right once its key or the clock is: it is to come whole again.
+  // A refused storebag is not stored, and may be accepted later, with another key or clock: the next request
+  // is unconditional.
   if (answer.kind == Kind::failed && StorebagRules::of(*choices).any()) answer.lastModified = lastModified;
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
@@ -169,7 +170,7 @@ double StorebagSections::jitter() {
   return choices ? *choices->jitter : 0;
 }
 
-// Clients can cause it at will.
+// Clients can trigger this line, so it is limited.
 void StorebagSections::refuse(std::int32_t clientType) {
   _counters.count(wire::Reason::settings_broken);
   const auto line = _refusals.happened(

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where each fact comes from.
+// Collects each fact from its source.
 #include "daemon/doctor.h"
 
 #include <sys/resource.h>

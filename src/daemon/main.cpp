@@ -32,10 +32,9 @@ using namespace std::chrono_literals;
 
 // The longest time from the signal to the end of the process.
 constexpr auto kStopBound = 10s;
-// What of it is left to a spool for the posts that have no answer until then.
+// The part of it that is reserved for the spool to keep unanswered posts.
 constexpr std::chrono::milliseconds kTimeToKeep = 3s;
-// Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
-// may have.
+// Connections to the control socket: in all, of one user, and reserved for root and the daemon's own user.
 constexpr std::size_t kMostObservers = 64;
 constexpr std::size_t kMostObserversOfOneUser = 32;
 constexpr std::size_t kObserversForOwner = 2;
@@ -120,7 +119,7 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-// Counts in a file that outlives a kill, if it can be had.
+// Keeps the counts in a file that survives a kill, if it can be made.
 void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord>& kept, double started) {
   auto record = platform::CountsRecord::open(services.root.countsPath(), services.files,
                                              services.root.countersPath(), started);
@@ -142,7 +141,7 @@ platform::StateFile::State countersState(const platform::Counters& counters, dou
           [&counters, started] { return counters.json(started); }};
 }
 
-// This and the next are not written before the first thing has left.
+// This file and the next are not written before anything has left.
 platform::StateFile::State allowanceState(const config::DailyAllowance& allowance) {
   return {"The day's account", [&allowance] { return platform::StateFile::Version{allowance.version()}; },
           [&allowance] { return allowance.text(); }, platform::StateFile::Version{}};
@@ -198,7 +197,7 @@ bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& lis
   return stuck == 0 && kept && written;
 }
 
-// Prints what one of the two known arguments asks for. False: there is none, and others are not read.
+// Handles the two known arguments. False if there is neither; other arguments are ignored.
 bool answerArguments(int count, char** arguments) {
   for (int i = 1; i < count; ++i) {
     const std::string_view argument = arguments[i];

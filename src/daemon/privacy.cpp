@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Hears the owner of the device, and answers.
+// Applies changes of the owner's decision, and answers questions about it.
 #include "daemon/privacy.h"
 
 #include <dirent.h>
@@ -33,7 +33,7 @@ bool isIdentifier(std::string_view key) {
          key.starts_with(kCustomIdentifier);
 }
 
-// Of the regular files in a directory whose names begin so.
+// The size of the regular files in a directory whose names have this prefix.
 std::uint64_t bytesIn(const std::string& directory, std::string_view beginning) {
   std::uint64_t bytes = 0;
   const std::unique_ptr<DIR, int (*)(DIR*)> opened(::opendir(directory.c_str()), ::closedir);
@@ -61,7 +61,7 @@ void Privacy::hearOwner() {
   _graceRuns = changed;
 }
 
-// True if the word has changed. What there is no memory for is done at the next call.
+// True if the decision has changed. A step that fails for lack of memory is repeated at the next call.
 bool Privacy::obey() {
   _toBeTold = _services.gate.refresh() || _toBeTold;
   if (!_toBeTold) return false;
@@ -133,7 +133,7 @@ Privacy::Answer Privacy::turnOff() {
     static_cast<void>(receipt.end());
     return Failure{stored.error()};
   }
-  // First, so that all is counted here: the spool drops it by itself once the word has changed.
+  // First, so that all posts are counted here: the spool drops them by itself once the decision has changed.
   std::size_t posts = emptySpool(wire::Reason::privacy_off);
   _graceRuns = obey() || _graceRuns;
   const auto begun = _services.http.refuseWaiting(false, kHTTPPatience);
@@ -197,7 +197,7 @@ Privacy::Answer Privacy::resetIdentifiers() {
   }
   _services.gate.identifiersReset();
   _graceRuns = obey() || _graceRuns;
-  // What waits bears the identifiers before. Sessions take the new ones at their next call.
+  // Waiting data contains the old identifiers. Sessions take the new ones at their next call.
   std::size_t posts = emptySpool(wire::Reason::refused_by_owner);
   static_cast<void>(_services.http.refuseWaiting(true, kHTTPPatience));
   _agent.dropIdentified();

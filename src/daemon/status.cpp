@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the rooms know of themselves, put together for those who ask.
+// Collects the status of all rooms.
 #include "daemon/status.h"
 
 #include <dirent.h>
@@ -59,7 +59,7 @@ Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
 Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord& word) {
   const session::FamilyFacts& facts = listed.facts;
   const Dictionary* info = facts.sessionInfo.get();
-  // The session itself may not have heard the word yet.
+  // The session itself may not have applied the latest decision yet.
   Dictionary user = facts.userInfo ? *facts.userInfo : Dictionary();
   config::EditedFields edits;
   if (word.fields) word.fields->apply(user, edits);

@@ -107,7 +107,7 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_OPENSOCKETDATA, this);
   options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
   options.set(CURLOPT_CLOSESOCKETDATA, _connections);
-  // Who asks for a storebag is told whether its server is trusted now, not when a kept connection was made.
+  // A storebag request uses a new connection, so that the server's certificate is checked now.
   const bool fresh = metEndedConnection() || _request.lane == HTTPRequest::Lane::storebag;
   options.set(CURLOPT_FRESH_CONNECT, fresh ? 1L : 0L);
   _connection = Connection::kept;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks libcurl's parser of URLs. Any thread.
+// Parses URLs with libcurl. Any thread.
 #include "http/host_name.h"
 
 #include <curl/curl.h>

@@ -18,7 +18,7 @@ static_assert(kOutQueueBound == wire::kFrameBodyLimit + wire::kFrameHeaderBytes)
 
 namespace {
 
-// Limits the reads from a client that goes on writing while its connection is closed.
+// Limits the reads from a client that keeps writing while its connection is closed.
 constexpr int kMostDrainingReads = 1024;
 // A growing buffer takes up to twice the bytes that wait.
 constexpr std::size_t kBytesOfByte = 2;

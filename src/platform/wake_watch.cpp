@@ -48,7 +48,7 @@ bool WakeWatch::happened() {
   return routeCame() || woke;
 }
 
-// All that waits is read. Where the kernel had no room, what was lost may have been a route.
+// Reads all waiting messages. If the kernel has dropped messages, a route may be among them.
 bool WakeWatch::routeCame() {
   bool came = false;
   alignas(nlmsghdr) char messages[8192];

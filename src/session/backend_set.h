@@ -37,9 +37,9 @@ struct BackendMaking {
   const config::OwnersWord& word;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
-  // Gets those that were not made, unless it is null.
+  // Receives the back ends that were not made, unless it is null.
   NotMade* notMade = nullptr;
-  // Those that the new ones take over from, by name; null: none.
+  // The previous back ends, from which the new ones take over by name; may be null.
   const BackendSet* before = nullptr;
 };
 
@@ -51,13 +51,13 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
 
-// Has each decide on its state. The set may be null, here and below.
+// Makes each back end decide on its state. The set may be null, here and below.
 void updateStates(const BackendSet* backends);
 
 // Called before the session releases the back ends.
 void cleanUp(const BackendSet* backends);
 
-// Tells the back ends what the owner's word is now. The session's thread.
+// Applies the owner's current decision to the back ends. The session's thread.
 void forbidByWord(const BackendSet& backends, const config::OwnersWord& word);
 
 // The names of those that are reporting or held.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Takes fields out as the owner's word asks. The session's thread.
+// Removes fields as the owner's policy requires. The session's thread.
 #include "session/heard_word.h"
 
 #include <utility>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session has heard of the owner's word. The session's thread.
+// The owner's decision as one session applies it. The session's thread.
 #pragma once
 
 #include <cstdint>
@@ -15,21 +15,21 @@ namespace veltrad::session {
 
 class HeardWord {
  public:
-  // The gate outlives it.
+  // The gate must outlive it.
   explicit HeardWord(const config::OwnerGate& gate) : _gate(gate) {}
 
-  // Hears the word while there is another one than before, and has it obeyed. What `obey` throws leaves the
-  // word unheard, so that it is heard at the next call.
+  // If the owner's decision has changed, takes it over and calls `obey`, until it stays the same. If `obey`
+  // throws, the next call tries again.
   void hear(const std::function<void()>& obey);
   const config::OwnersWord& now() const { return *_word; }
-  // If the word that was heard last came with other identifiers than the one before, reads the device's anew
-  // and has the back ends read theirs. These read consent again if the policy asks for it at any time. `set`
-  // may be null.
+  // If the identifiers were reset since the decision before, reads the device's identifier again and makes
+  // the back ends read theirs. The back ends also read the consent again if the policy requires it. `set` may
+  // be null.
   void takeIdentity(support::DeviceIdentity& device, char (&deviceID)[41], const BackendSet* set) const;
-  // With what of it may leave: null stays null, and what holds nothing that the owner keeps back the same
+  // Adds the part that may leave: null stays null, and user info without withheld fields stays the same
   // object.
   backends::UserInfo allowed(const backends::SharedDictionary& userInfo) const;
-  // Take out what the owner keeps back, and say what that was.
+  // Remove the fields that the owner withholds, and return their names.
   config::EditedFields restrict(std::optional<Dictionary>& payload) const;
   config::EditedFields restrict(Array& logData) const;
 

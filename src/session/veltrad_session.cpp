@@ -152,7 +152,7 @@ void VeltradSession::updateSessionWithDefaultSessionInfo() {
   _sessionDelegate.userInfoUpdatedForSession(familyFacts());
   updateStates(_backends.get());
   _sessionDelegate.updateDownstreamSessions(familyFacts());
-  // After the daemon knows the back ends, so that it tells them of any later word.
+  // Only now, because the daemon knows the back ends and tells them every later decision.
   if (_backends) forbidByWord(*_backends, _word.now());
 }
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The operations of the wire protocol, as far as a test can tell the difference.
+// The operations of the wire protocol, as far as tests can observe them.
 #include "testing/played_session.h"
 
 #include <algorithm>
@@ -19,7 +19,7 @@ namespace {
 
 constexpr const char* kBackend = "testing";
 
-// Those that need nothing but an answer without results.
+// Operations that only need an answer without results.
 constexpr std::string_view kPlain[] = {operation::kSetSessionInfo, operation::kFetchDisplayURL,
                                        operation::kFlushMessages, operation::kFinishSession};
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers the calls of one connection as the script says. The connection's own thread.
+// A simulated session: answers the calls of one connection as the script says. The connection's own thread.
 #pragma once
 
 #include <memory>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Opens the door in a directory of its own.
+// Listens in a directory of its own.
 #include "testing/stand_in.h"
 
 #include <stdlib.h>
@@ -14,7 +14,7 @@ namespace veltrad::testing {
 
 namespace {
 
-// For what has arrived to be run.
+// The time for running the calls that have arrived.
 constexpr std::chrono::seconds kLongestStop{5};
 
 }  // namespace

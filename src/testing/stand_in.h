@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The daemon of a test: the real daemon's door, with sessions that play behind it.
+// The daemon for tests: the real daemon's listener and connections, with simulated sessions.
 #pragma once
 
 #include <memory>
@@ -41,7 +41,7 @@ class StandIn final : public ipc::ListenerDelegate {
   explicit StandIn(TestRoot directory);
   ~StandIn() override { stop(); }
 
-  // What went wrong; absent if it serves.
+  // Starts to serve. Returns the error; absent on success.
   std::optional<std::string> start();
   std::optional<std::string> restart();
 

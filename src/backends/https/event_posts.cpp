@@ -37,7 +37,7 @@ wire::Reason reasonOf(const http::HTTPError& error) {
   return wire::Reason::post_failed;
 }
 
-// Whether the owner keeps back a name by which the client entry is chosen.
+// Whether the owner withholds a name by which the client entry is chosen.
 bool hidesNames(const SessionFacts& facts) {
   const auto name = [](const SharedDictionary& info, const char* key) {
     return info ? info->string(key) : nullptr;
@@ -50,7 +50,7 @@ bool hidesNames(const SessionFacts& facts) {
   return false;
 }
 
-// What is needed to send it again. The request shares its body.
+// Copies the data that is needed to send the post again. The request shares its body.
 void takeForSpool(const std::shared_ptr<SpooledPost>& post, const SessionFacts& facts,
                   http::HTTPRequest& request) {
   support::SpoolEntry& entry = post->entry;

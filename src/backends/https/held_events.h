@@ -19,7 +19,7 @@
 
 namespace veltrad::backends {
 
-// Shared, because the account may use it after its back end has gone. The counters outlive it.
+// Shared, because the account may use it after its back end has gone. The counters must outlive it.
 class HeldEvents final : public platform::Evictable {
  public:
   // The charge pays for the events and for what a flush makes of them.

@@ -57,7 +57,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
   setDisplayURL(profile->displayURL);
 }
 
-// What is new in the filters reaches the events of the batch as ever: with the user info of the flush.
+// New filters apply to the batched events only in the user info that the flush adds.
 void HTTPSPostBackend::takeOver(VeltraBackend& before) {
   VeltraBackend::takeOver(before);
   auto* other = dynamic_cast<HTTPSPostBackend*>(&before);

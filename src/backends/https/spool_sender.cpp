@@ -19,7 +19,7 @@ namespace veltrad::backends {
 
 namespace {
 
-// How often the owner's word and the age of posts are looked at while the spool holds anything.
+// How often the owner's decision and the age of posts are checked while the spool is not empty.
 constexpr double kLook = 0.3;
 constexpr double kIdle = 3600;
 // Until a post is tried again whose file or facts cannot be read, or whose storebag is being fetched.
@@ -27,7 +27,7 @@ constexpr double kUntilDecided = 0.1;
 // Between two attempts at all that could not be read, or decided on.
 constexpr std::chrono::seconds kApart{1};
 constexpr std::size_t kStackBytes = 256u << 10;
-// Names that are taken out of the queue at once.
+// The number of names that are taken out of the queue at once.
 constexpr std::size_t kSome = 256;
 
 http::HTTPRequest requestOf(const std::shared_ptr<const support::SpoolEntry>& post) {

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the owner's word, the section and its client entry, in this order.
+// Checks the owner's decision, the section and its client entry, in this order.
 #include "backends/https/spool_verdicts.h"
 
 #include <fmt/format.h>

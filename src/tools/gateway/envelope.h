@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// An envelope of events as devices post it, and what of an event has a column of its own in the tables.
+// Parses envelopes of events, and extracts the fields of an event that have columns in the tables.
 #pragma once
 
 #include <cstdint>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The messages that the stream has not taken yet: which are to be published now, and which have waited too
-// long.
+// The messages that the stream has not confirmed yet: decides which are published now, and which have waited
+// too long.
 #pragma once
 
 #include <chrono>

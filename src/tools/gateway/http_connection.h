@@ -116,7 +116,7 @@ class HTTPConnection : public std::enable_shared_from_this<HTTPConnection> {
   Owner& _owner;
   boost::beast::basic_stream<Protocol> _stream;
   HandlerMemory _memory;
-  // What was read and not yet parsed: at most a header, a chunk's line, or a piece of a body.
+  // Bytes that were read and not parsed yet: at most a header, a chunk's line, or a piece of a body.
   boost::beast::flat_buffer _buffer{std::size_t{64} << 10};
   std::optional<Parser> _parser;
   std::unique_ptr<BodyHandler> _bodyHandler;

@@ -164,7 +164,7 @@ HTTPServer::HTTPServer(Handler handler, Bounds bounds, std::function<void()> onS
 }
 
 HTTPServer::~HTTPServer() {
-  // Connections end without a word, with the context's handlers.
+  // Connections are closed without an answer, with the context's handlers.
   _library->stopping = true;
   _library->stopped = nullptr;
 }

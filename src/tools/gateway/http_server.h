@@ -18,7 +18,7 @@
 
 namespace veltrad::gateway {
 
-// What the handler gets to see of a request's head. Valid during the call.
+// The head of a request, for the handler. Valid during the call.
 class RequestHead {
  public:
   virtual ~RequestHead() = default;
@@ -59,7 +59,7 @@ class BodyHandler {
 
 class HTTPServer {
  public:
-  // Answers a request at its head, or returns who takes its body. On the server's thread.
+  // Answers a request by its head, or returns the handler of its body. On the server's thread.
   using Handler = std::function<std::variant<Answer, std::unique_ptr<BodyHandler>>(const RequestHead&)>;
 
   struct Bounds {

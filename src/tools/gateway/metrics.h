@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What gateway and drain count, and its text. Any thread.
+// The counters of gateway and drain, and their OpenMetrics text. Any thread.
 #pragma once
 
 #include <array>
@@ -31,7 +31,7 @@ class LabelledCounter {
   std::map<std::string, std::uint64_t, std::less<>> _values GUARDED_BY(_mutex);
 };
 
-// Of a gateway.
+// The metrics of a gateway.
 class Metrics {
  public:
   void published(std::chrono::steady_clock::duration took);

@@ -22,7 +22,7 @@ constexpr int kMostPingsOut = 2;
 constexpr std::int64_t kReconnectMilliseconds = 250;
 constexpr std::int64_t kConnectMilliseconds = 2'000;
 constexpr std::int64_t kWriteMilliseconds = 5'000;
-// A connection that is lost keeps nothing: what was not answered is published again.
+// A lost connection keeps nothing, because unanswered messages are published again.
 constexpr int kReconnectBytes = 64 << 10;
 constexpr std::chrono::seconds kLongestClose{5};
 

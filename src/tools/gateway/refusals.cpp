@@ -13,7 +13,7 @@ namespace {
 
 constexpr const char* kRefusedHeader = "X-VLT-Refused";
 constexpr std::size_t kMostDetailBytes = 512;
-// Seconds; the random part spreads those who come back.
+// Seconds; the random part spreads the repeated requests.
 constexpr unsigned kRetryAfter = 5;
 constexpr unsigned kRetrySpread = 10;
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers that refuse: counts them, and keeps apart what was malformed.
+// Makes refusing answers, counts them, and stores malformed bodies separately.
 #pragma once
 
 #include <chrono>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts the gateway's parts together and takes them apart in order.
+// Constructs the parts of the gateway and stops them in order.
 #include "gateway/serve.h"
 
 #include <sys/resource.h>
@@ -21,7 +21,7 @@ namespace veltrad::gateway {
 
 namespace {
 
-// What has begun is answered until then.
+// Open requests are answered until then.
 constexpr std::chrono::seconds kLongestStop{10};
 // The process ends then, whatever still blocks: what was confirmed is in the stream, or in the tables.
 constexpr unsigned kLongestEndSeconds = 14;

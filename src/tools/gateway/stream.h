@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The stream, as those use it who put messages into it.
+// The publishing side of the stream.
 #pragma once
 
 #include <atomic>

@@ -121,7 +121,7 @@ std::optional<std::string> StreamReader::add(natsMsg* message, std::vector<Strea
   jsMsgMetaData* found = nullptr;
   if (natsMsg_GetMetaData(&found, message) != NATS_OK) return "a message without its place in the stream";
   const std::unique_ptr<jsMsgMetaData, FreeMetaData> data(found);
-  // What was delivered and did not arrive is not delivered again.
+  // Delivered messages that did not arrive are not delivered again.
   if (data->Sequence.Consumer != _delivered + 1)
     return fmt::format("delivery {} came behind delivery {}", data->Sequence.Consumer, _delivered);
   _delivered = data->Sequence.Consumer;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The stream, as the drain reads it: in order, from a given place.
+// Reads the stream in order, from a given place.
 #pragma once
 
 #include <cstdint>

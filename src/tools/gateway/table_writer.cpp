@@ -17,7 +17,7 @@ constexpr const char* kTryLock =
     "SELECT pg_try_advisory_lock(hashtext('veltra-gateway drain'), hashtext($1))";
 // Rows are copied when they have grown to this, all in one transaction.
 constexpr std::size_t kMostRowBytes = 16u << 20;
-// Of an index that is made for rows that are there, and of forgetting.
+// The limit for making an index over existing rows, and for deleting old rows.
 constexpr std::chrono::minutes kLongestHousekeeping{30};
 
 // Only digits of IDs get into statements.
@@ -70,7 +70,7 @@ Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const StreamMe
                                                                   const StreamMessage* end) {
   auto written = writeTogether(begin, end, "");
   if (written || written.error().kind != StoreError::Kind::data) return written;
-  // One of them cannot be stored as it is: it is found in few transactions, and kept in another table.
+  // One message cannot be stored: it is found in few transactions, and kept in another table.
   if (end - begin == 1) {
     written = writeTogether(begin, end, "drain: " + written.error().detail);
     if (written) written.value().refused = 1;

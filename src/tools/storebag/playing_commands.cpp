@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The commands that play storebags: explain, diff and test.
+// The commands that evaluate storebags: explain, diff and test.
 #include <fmt/format.h>
 
 #include "formats/json.h"
