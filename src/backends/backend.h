@@ -12,15 +12,15 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/backend_state_recorder.h"
 #include "backends/client_match.h"
 #include "backends/lock_ranks.h"
 #include "backends/session_facts.h"
-#include "backends/standing_record.h"
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "platform/random.h"
 #include "wire/error.h"
 #include "wire/fates.h"
@@ -126,7 +126,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   const std::optional<std::string>& displayURL() const { return _displayURL; }
   // Sets the ring for the record of fates, before the first message; may be null.
   void keepFates(platform::FateRing* ring) { _pen = {ring, _name}; }
-  const platform::FatePen& pen() const { return _pen; }
+  const platform::FateWriter& pen() const { return _pen; }
 
   // Any thread. Never null; a change of the facts does not affect those that a caller already has.
   SharedFacts facts() const;
@@ -184,11 +184,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   const std::string _productFamily;
   const double _samplingFactor;
   std::optional<std::string> _displayURL;
-  platform::FatePen _pen;
+  platform::FateWriter _pen;
 
   // The session's thread only.
   std::uint16_t _eventID = 0;
-  StandingRecord _standing;
+  BackendStateRecorder _standing;
 
   std::atomic<StateVerdict> _state{StateVerdict()};
   std::atomic<int> _prohibition{-1};  // a reason; negative: none

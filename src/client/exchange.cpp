@@ -76,7 +76,7 @@ void Exchange::adopt(FileDescriptor socket) {
 }
 
 void Exchange::attempted(FileDescriptor socket) {
-  const SessionStanding& standing = _record.standing();
+  const SessionDescription& standing = _record.standing();
   _socket = std::move(socket);
   _wish.attempted(Reconnection::Clock::now());
   if (standing.described()) _record.calls().add(0, false);

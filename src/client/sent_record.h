@@ -6,7 +6,7 @@
 #include <memory>
 #include <string>
 
-#include "client/session_standing.h"
+#include "client/session_description.h"
 #include "client/uploaded_file.h"
 #include "client/written_calls.h"
 
@@ -37,8 +37,8 @@ class SentRecord {
 
   WrittenCalls& calls() { return _calls; }
   const WrittenCalls& calls() const { return _calls; }
-  SessionStanding& standing() { return _standing; }
-  const SessionStanding& standing() const { return _standing; }
+  SessionDescription& standing() { return _standing; }
+  const SessionDescription& standing() const { return _standing; }
   // Calls that were written, on all connections.
   std::uint64_t sent() const { return _sent; }
   std::uint64_t lost() const { return _lost; }
@@ -47,7 +47,7 @@ class SentRecord {
   std::uint64_t untold() const { return _lost - _told; }
 
  private:
-  SessionStanding _standing;
+  SessionDescription _standing;
   WrittenCalls _calls;
   std::uint64_t _sent = 0;
   std::uint64_t _lost = 0;

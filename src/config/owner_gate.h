@@ -31,7 +31,7 @@ class History;
 namespace veltrad::config {
 
 // The owner's decision at one time. Immutable.
-struct OwnersWord {
+struct OwnerDecision {
   std::shared_ptr<const Policy> policy = Policy::closed();
   // Why no back end reports; nothing: each may.
   std::optional<wire::Reason> refusal = wire::Reason::policy_broken;
@@ -60,7 +60,7 @@ class OwnerGate final : public http::RequestGate {
   // To be called after identifiers and secret were replaced; the next refresh() publishes this.
   void identifiersReset() { _resets.fetch_add(1, std::memory_order_relaxed); }
   // The decision of the last refresh, never null.
-  std::shared_ptr<const OwnersWord> word() const;
+  std::shared_ptr<const OwnerDecision> decision() const;
   // Grows with each change of the decision, so that readers detect a change cheaply.
   std::uint64_t turn() const { return _turn.load(std::memory_order_acquire); }
   // For a storebag request only the host is checked.
@@ -94,7 +94,7 @@ class OwnerGate final : public http::RequestGate {
   std::atomic<std::uint64_t> _resets{0};
   DropReceipt _receipt;
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  std::shared_ptr<const OwnersWord> _word GUARDED_BY(_mutex) = std::make_shared<const OwnersWord>();
+  std::shared_ptr<const OwnerDecision> _decision GUARDED_BY(_mutex) = std::make_shared<const OwnerDecision>();
 };
 
 }  // namespace veltrad::config

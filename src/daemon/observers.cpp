@@ -153,7 +153,7 @@ Observers::Answer Observers::status(const Dictionary&) {
 
 Observers::Answer Observers::sessions(const Dictionary& arguments) {
   const Value* after = arguments.find("after");
-  return statusOfSessions(_agent, *_services.gate.word(),
+  return statusOfSessions(_agent, *_services.gate.decision(),
                           static_cast<std::uint64_t>(after ? after->toInt64().value_or(0) : 0));
 }
 

@@ -65,18 +65,19 @@ void Privacy::hearOwner() {
 bool Privacy::obey() {
   _toBeTold = _services.gate.refresh() || _toBeTold;
   if (!_toBeTold) return false;
-  const auto word = _services.gate.word();
+  const auto decision = _services.gate.decision();
   logInfo("hearOwner: The owner's word has changed: %s",
-          word->refusal ? wire::entryOf(*word->refusal).name.data() : "back ends may report");
-  _agent.tellOwnersWord(*word);
-  _factory.dropWaiting(
-      [&word](const std::string& host) { return word->refusal.has_value() || !word->policy->reaches(host); });
+          decision->refusal ? wire::entryOf(*decision->refusal).name.data() : "back ends may report");
+  _agent.tellOwnerDecision(*decision);
+  _factory.dropWaiting([&decision](const std::string& host) {
+    return decision->refusal.has_value() || !decision->policy->reaches(host);
+  });
   _toBeTold = false;
   return true;
 }
 
 const char* Privacy::reporting() const {
-  const auto refusal = _services.gate.word()->refusal;
+  const auto refusal = _services.gate.decision()->refusal;
   return refusal == wire::Reason::privacy_off || refusal == wire::Reason::policy_reporting ||
                  refusal == wire::Reason::policy_broken
              ? "off"
@@ -89,13 +90,14 @@ Privacy::Answer Privacy::show() {
   if (!consent) return Failure{consent.error().description};
   auto known = identifiers();
   if (!known) return Failure{known.error()};
-  const auto word = _services.gate.word();
+  const auto decision = _services.gate.decision();
   const auto& given = consent.value();
-  return Dictionary{{"reporting", reporting()},
-                    {"consent", given ? Value(given->toBoolean().value_or(false)) : nullValue()},
-                    {"policy", word->policy->broken() ? Value("broken") : orNull(word->policy->asGiven())},
-                    {"identifiers", std::move(known.value())},
-                    {"destinations", _services.destinations.lastDay()}};
+  return Dictionary{
+      {"reporting", reporting()},
+      {"consent", given ? Value(given->toBoolean().value_or(false)) : nullValue()},
+      {"policy", decision->policy->broken() ? Value("broken") : orNull(decision->policy->asGiven())},
+      {"identifiers", std::move(known.value())},
+      {"destinations", _services.destinations.lastDay()}};
 }
 
 Result<Array, std::string> Privacy::identifiers() {

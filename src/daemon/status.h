@@ -9,7 +9,7 @@
 #include "base/value.h"
 
 namespace veltrad::config {
-struct OwnersWord;
+struct OwnerDecision;
 }  // namespace veltrad::config
 
 namespace veltrad::http {
@@ -56,6 +56,6 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers);
 // [{"name", "state", "reason": {"name", "text"}, "held", "underWay", "lastOutcome"}]}], "more": true where
 // there are others}. "id" is the number, "parent" that of the parent session, if there is one. Names are
 // truncated to 256 bytes; names that the owner withholds are left out.
-Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after);
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnerDecision& decision, std::uint64_t after);
 
 }  // namespace veltrad::daemon

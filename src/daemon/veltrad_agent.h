@@ -54,7 +54,7 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
 
   // Applies the owner's decision to the back ends of all sessions; back ends that may not report drop their
   // waiting data.
-  void tellOwnersWord(const config::OwnersWord& word);
+  void tellOwnerDecision(const config::OwnerDecision& decision);
   // The open sessions by the name of their storebag; those that have none are left out.
   using Followers = std::map<std::string, std::vector<ListedSession>>;
   Followers followers() const;

@@ -60,7 +60,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
     if (making.notMade) making.notMade->emplace_back(name, why);
   };
   for (const auto& [name, profile] : storebag->backends) {
-    if (!making.word.policy->makes(name)) {
+    if (!making.decision.policy->makes(name)) {
       making.counters.count(wire::Reason::policy_backends);
       notMade(name, wire::Reason::policy_backends);
       continue;
@@ -74,7 +74,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
       continue;
     }
     if (backend->hostsAreFixed() &&
-        making.word.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
+        making.decision.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
       making.counters.count(wire::Reason::policy_hosts);
       notMade(name, wire::Reason::policy_hosts);
       backend->cleanup();
@@ -96,9 +96,9 @@ void cleanUp(const BackendSet* backends) {
   for (const auto& [name, backend] : *backends) backend->cleanup();
 }
 
-void forbidByWord(const BackendSet& backends, const config::OwnersWord& word) {
+void applyProhibitions(const BackendSet& backends, const config::OwnerDecision& decision) {
   for (const auto& [name, backend] : backends) {
-    backend->setProhibition(word.refusalFor(name, backend->hosts()));
+    backend->setProhibition(decision.refusalFor(name, backend->hosts()));
   }
 }
 

@@ -34,7 +34,7 @@ struct BackendMaking {
   const support::Veltra& library;
   platform::Clock& clock;
   platform::Counters& counters;
-  const config::OwnersWord& word;
+  const config::OwnerDecision& decision;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
   // Receives the back ends that were not made, unless it is null.
@@ -58,7 +58,7 @@ void updateStates(const BackendSet* backends);
 void cleanUp(const BackendSet* backends);
 
 // Applies the owner's current decision to the back ends. The session's thread.
-void forbidByWord(const BackendSet& backends, const config::OwnersWord& word);
+void applyProhibitions(const BackendSet& backends, const config::OwnerDecision& decision);
 
 // The names of those that are reporting or held.
 std::vector<std::string> reportingNames(const BackendSet& backends);

@@ -11,7 +11,7 @@
 
 #include "backends/backend.h"
 #include "config/storebag_content.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "session/backend_set.h"
 
 namespace veltrad::session {
@@ -48,7 +48,7 @@ class SessionFates {
   backends::MessageNote taken(Item item);
 
  private:
-  const platform::FatePen _pen;
+  const platform::FateWriter _pen;
   // Position of the session's entry; 0 if there is none.
   std::uint64_t _session = 0;
   config::StorebagOrigin _origin;

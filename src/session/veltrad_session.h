@@ -19,7 +19,7 @@
 #include "platform/preferences.h"
 #include "session/backend_set.h"
 #include "session/given_storebag.h"
-#include "session/heard_word.h"
+#include "session/owner_filter.h"
 #include "session/session_fates.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
@@ -137,7 +137,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
   backends::UserInfo _userInfo;
-  HeardWord _word;
+  OwnerFilter _ownerFilter;
   SessionFates _fates;
   // It must not join its family again.
   bool _leftFamily = false;

@@ -20,7 +20,7 @@
 #include "base/mutex.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "platform/memory_budget.h"
 #include "wire/fates.h"
 
@@ -47,7 +47,7 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
     std::string address;  // "udp://IP:PORT"
     // Counts for the owner's daily limits; must outlive the queue. May be null.
     config::OwnerGate* gate = nullptr;
-    platform::FatePen pen = {};
+    platform::FateWriter pen = {};
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,

@@ -192,7 +192,7 @@ void EventPosts::endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<Spool
 // Returns the post's number in the record.
 std::uint64_t EventPosts::notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
                                    wire::StepEntry fate) {
-  const platform::FatePen& pen = backEnd.pen();
+  const platform::FateWriter& pen = backEnd.pen();
   if (!pen.writes()) return 0;
   fate.post = pen.newNumber();
   fate.text = pen.textOf(request.url);

@@ -28,7 +28,7 @@ struct HTTPSPostMaking {
   platform::Locale& locale;
   platform::Counters& counters;
   EventPosts& posts;
-  platform::FatePen pen;
+  platform::FateWriter pen;
   PostIdentity::Sources identity;
   // Null: the owner sets no limits.
   config::OwnerGate* gate = nullptr;

@@ -12,8 +12,8 @@
 #include <vector>
 
 #include "backends/https/spool_backlog.h"
-#include "backends/https/spool_notes.h"
 #include "backends/https/spool_queue.h"
+#include "backends/https/spool_recorder.h"
 #include "backends/https/spool_removals.h"
 #include "backends/https/spool_rules.h"
 #include "backends/https/spool_sections.h"
@@ -136,7 +136,7 @@ class PostSpool {
   const platform::Clock& _clock;
   platform::Counters& _counters;
   SpoolRules _rules;
-  const SpoolNotes _notes;
+  const SpoolRecorder _notes;
   support::SpoolAge _age;
   const support::SpoolFolder _folder;
   SpoolRemovals _removals;

@@ -40,21 +40,21 @@ class SpoolRules {
   // As in spool_verdicts.h, with the owner's current decision.
   LeaveVerdict verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
                        const std::optional<ClientFacts>& facts) const {
-    return verdictOnLeaving(post, *_sources.gate.word(), section, facts);
+    return verdictOnLeaving(post, *_sources.gate.decision(), section, facts);
   }
   std::optional<wire::Reason> ownersRefusal(const support::SpoolEntry& post) const {
-    return refusalByOwner(post, *_sources.gate.word());
+    return refusalByOwner(post, *_sources.gate.decision());
   }
   // Why nothing may leave.
-  std::optional<wire::Reason> refusalOfAll() const { return _sources.gate.word()->refusal; }
+  std::optional<wire::Reason> refusalOfAll() const { return _sources.gate.decision()->refusal; }
 
   // The owner's decision; changes with the policy and the consent, not during a shortage.
-  struct Word {
+  struct OwnerState {
     std::uint64_t turn = 0;
     bool consent = false;
-    bool operator==(const Word&) const = default;
+    bool operator==(const OwnerState&) const = default;
   };
-  Word word(const Word& before) const;
+  OwnerState ownerState(const OwnerState& before) const;
 
  private:
   // Absent if it cannot be read at the moment.

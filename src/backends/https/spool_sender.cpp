@@ -81,7 +81,7 @@ void SpoolSender::wake() {
 }
 
 void SpoolSender::run() {
-  _word = _spool.rules().word({});
+  _owner = _spool.rules().ownerState({});
   while (!_stops) {
     double next = kLook;
     try {
@@ -130,14 +130,14 @@ double SpoolSender::load() {
 }
 
 void SpoolSender::askAgain() {
-  const SpoolRules::Word word = _spool.rules().word(_word);
+  const SpoolRules::OwnerState owner = _spool.rules().ownerState(_owner);
   const std::uint64_t sections = _spool.sections().turn();
   const auto now = std::chrono::steady_clock::now();
   const bool again = _undecided && _undecidedAgain <= now;
-  if (word == _word && sections == _sections && !again) return;
+  if (owner == _owner && sections == _sections && !again) return;
   // Consent that is withdrawn does not wait for a storebag that might override it.
-  const bool withdrawn = _word.consent && !word.consent;
-  _word = word;
+  const bool withdrawn = _owner.consent && !owner.consent;
+  _owner = owner;
   _sections = sections;
   _facts = _spool.rules().facts();
   _undecidedAgain = now + kApart;
@@ -151,7 +151,7 @@ bool SpoolSender::askForAll(bool withoutWaiting) {
   std::uint64_t after = 0;
   for (auto names = _spool.queue().names(after, kSome); !names.empty() && !_stops;
        names = _spool.queue().names(after, kSome)) {
-    if (_spool.rules().word(_word) != _word) return false;  // all begins again
+    if (_spool.rules().ownerState(_owner) != _owner) return false;  // all begins again
     for (const PostSpool::Name& name : names) {
       after = name.order;
       if (all) {

@@ -11,7 +11,7 @@
 #include "backends/https/post_spool.h"
 #include "base/file_descriptor.h"
 #include "base/thread.h"
-#include "platform/wake_watch.h"
+#include "platform/network_watch.h"
 
 namespace veltrad::backends {
 
@@ -63,8 +63,8 @@ class SpoolSender {
   Thread _thread;
 
   // The thread only.
-  platform::WakeWatch _watch;
-  SpoolRules::Word _word;
+  platform::NetworkWatch _watch;
+  SpoolRules::OwnerState _owner;
   std::uint64_t _sections = 0;        // SpoolSections::turn() of the last time that all were asked for
   std::optional<ClientFacts> _facts;  // as just read
   bool _undecided = false;            // some could not be decided on

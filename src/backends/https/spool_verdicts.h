@@ -12,7 +12,7 @@
 #include "wire/reasons.h"
 
 namespace veltrad::config {
-struct OwnersWord;
+struct OwnerDecision;
 }  // namespace veltrad::config
 
 namespace veltrad::support {
@@ -42,11 +42,12 @@ struct LeaveVerdict {
 };
 
 // The owner's decision comes first.
-std::optional<wire::Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnersWord& word);
+std::optional<wire::Reason> refusalByOwner(const support::SpoolEntry& post,
+                                           const config::OwnerDecision& decision);
 // Then the client entry in the current section decides, or consent without a section (null). Sampling is not
 // drawn again: the factor in `facts` is not used. `facts` may be null if they cannot be read at the moment; a
 // post that depends on them waits.
-LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnersWord& word,
+LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnerDecision& decision,
                               const config::StorebagSection* section,
                               const std::optional<ClientFacts>& facts);
 

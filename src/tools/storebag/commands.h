@@ -79,14 +79,14 @@ Outcome format(const FormatRequest& request);
 Outcome schema();
 
 // The session of an evaluation, and the files with further input.
-struct PlayedSession {
+struct SimulatedSession {
   Given given;
   std::optional<std::string> device, policy, messages;
 };
 
 struct ExplainRequest {
   std::string file;
-  PlayedSession session;
+  SimulatedSession session;
   std::vector<std::string> payload;
   std::optional<std::string> payloadFile;
   std::optional<std::uint16_t> category, type;
@@ -98,7 +98,7 @@ Outcome explain(const ExplainRequest& request);
 
 struct DiffRequest {
   std::string before, now;
-  PlayedSession session;
+  SimulatedSession session;
   bool json = false;
 };
 // Says what changes between two states of a storebag; `findings`: more leaves devices than before.

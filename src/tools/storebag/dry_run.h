@@ -43,7 +43,7 @@ class DryRun {
 
   const Given& _given;
   DryWorld _world;
-  const std::shared_ptr<const config::OwnersWord> _word;
+  const std::shared_ptr<const config::OwnerDecision> _decision;
   std::optional<Dictionary> _sentUserInfo;
   config::EditedFields _userInfoEdits;
   session::NotMade _notMade;

@@ -188,17 +188,17 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
   const std::size_t count = given.messages.size();
   told.fates.assign(count, {wire::Fate::dropped, std::nullopt});
   DryWorld world(given, name);
-  const auto word = world.gate.word();
+  const auto decision = world.gate.decision();
   const bool hasServer = profile && profile->ip && profile->port;
   told.reason = Reason::bad_address;
-  if (!word->policy->makes(name))
+  if (!decision->policy->makes(name))
     told.reason = Reason::policy_backends;
-  else if (hasServer && word->refusalFor(name, {*profile->ip}) == Reason::policy_hosts)
+  else if (hasServer && decision->refusalFor(name, {*profile->ip}) == Reason::policy_hosts)
     told.reason = Reason::policy_hosts;
   if (told.reason != Reason::bad_address || !hasServer ||
       !backends::parseIPv4Address(*profile->ip, *profile->port))
     return told;
-  const auto refusal = word->refusalFor(name, {*profile->ip});
+  const auto refusal = decision->refusalFor(name, {*profile->ip});
   told.state = refusal ? backends::kBackendDisabled : backends::kBackendReporting;
   told.reason = refusal.value_or(Reason::always);
   told.chance = chanceOf(told);
@@ -208,7 +208,7 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
   for (const GivenMessage& message : given.messages) {
     Dictionary payload = message.payload.value_or(Dictionary());
     config::EditedFields edits;
-    if (word->fields) word->fields->apply(payload, edits);
+    if (decision->fields) decision->fields->apply(payload, edits);
     addEdits(edits, told);
     char field[backends::PacketText::kSize];
     backends::PacketText(field).append(payload);

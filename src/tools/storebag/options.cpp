@@ -155,7 +155,7 @@ CLI::Option* addEach(CLI::App& command, const std::string& name, const std::stri
   return addTaken<std::vector<std::string>>(command, name, help, takeAll)->allow_extra_args(false);
 }
 
-void addSession(CLI::App& command, PlayedSession& played) {
+void addSession(CLI::App& command, SimulatedSession& played) {
   Given& session = played.given;
   command.add_option("--client-type", session.clientType, "Kind of client, which selects the storebag")
       ->type_name("N")
@@ -181,7 +181,7 @@ void addSession(CLI::App& command, PlayedSession& played) {
   command.add_flag("--batch-events", session.batchEvents, "Let back ends collect events");
 }
 
-void addDevice(CLI::App& command, PlayedSession& played) {
+void addDevice(CLI::App& command, SimulatedSession& played) {
   Given& session = played.given;
   addTaken<std::string>(command, "--country", "Country of the locale; without it there is none",
                         [&session](const std::string& code) { return session.takeCountry(code); })

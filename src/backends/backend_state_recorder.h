@@ -4,15 +4,15 @@
 
 #include <cstdint>
 
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 
 namespace veltrad::backends {
 
 // One entry serves many messages, until the back end's state changes, or until the entry is so old that it
 // would be overwritten before the entries that refer to it.
-class StandingRecord {
+class BackendStateRecorder {
  public:
-  wire::FateRef of(const platform::FatePen& pen, const wire::StandingEntry& now) {
+  wire::FateRef of(const platform::FateWriter& pen, const wire::StandingEntry& now) {
     if (!pen.writes()) return 0;
     const wire::FateWords words = wire::wordsOf(now);
     if (words != _last || !pen.ring()->fresh(_position)) {

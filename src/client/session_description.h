@@ -27,7 +27,7 @@ struct SessionChange {
   bool finishes = false;
 };
 
-class SessionStanding {
+class SessionDescription {
  public:
   void apply(const SessionChange& change);
 

@@ -6,19 +6,20 @@
 #include <string_view>
 
 #include "config/field_changes.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 
 namespace veltrad::config {
 
 // Writes a few names at a time, and the rest in the destructor. Allocates nothing.
-class NotedChanges final : public FieldChanges {
+class FieldChangeRecorder final : public FieldChanges {
  public:
   // `about` names the message or the batch, and the time.
-  NotedChanges(const platform::FatePen& pen, const wire::NamesEntry& about) : _pen(pen), _about(about) {
+  FieldChangeRecorder(const platform::FateWriter& pen, const wire::NamesEntry& about)
+      : _pen(pen), _about(about) {
     _about.backend = pen.backend();
   }
-  NotedChanges(const NotedChanges&) = delete;
-  ~NotedChanges() override { write(); }
+  FieldChangeRecorder(const FieldChangeRecorder&) = delete;
+  ~FieldChangeRecorder() override { write(); }
 
   void changed(FieldChange change, std::string_view name) override {
     note(change == FieldChange::removed ? wire::Step::removed : wire::Step::hashed, name);
@@ -43,7 +44,7 @@ class NotedChanges final : public FieldChanges {
     _about.count = 0;
   }
 
-  const platform::FatePen _pen;
+  const platform::FateWriter _pen;
   wire::NamesEntry _about;
 };
 

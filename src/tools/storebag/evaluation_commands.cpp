@@ -34,7 +34,7 @@ Fault readMessage(const ExplainRequest& request, Given& given) {
   return std::nullopt;
 }
 
-Fault readFiles(const PlayedSession& session, Given& given) {
+Fault readFiles(const SimulatedSession& session, Given& given) {
   if (session.device) {
     if (auto fault = taken(readDevice(*session.device), given.device)) return fault;
   }

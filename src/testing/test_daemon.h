@@ -36,10 +36,10 @@ class TestRoot {
 };
 
 // start(), restart() and the destructor are for one thread at a time; script() and answers() for any.
-class StandIn final : public ipc::ListenerDelegate {
+class TestDaemon final : public ipc::ListenerDelegate {
  public:
-  explicit StandIn(TestRoot directory);
-  ~StandIn() override { stop(); }
+  explicit TestDaemon(TestRoot directory);
+  ~TestDaemon() override { stop(); }
 
   // Starts to serve. Returns the error; absent on success.
   std::optional<std::string> start();

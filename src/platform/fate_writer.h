@@ -11,12 +11,13 @@
 namespace veltrad::platform {
 
 // A copy writes for the same back end. The ring must outlive it.
-class FatePen {
+class FateWriter {
  public:
   // Writes nothing.
-  FatePen() = default;
+  FateWriter() = default;
   // `ring` may be null; `backend`: its name, or empty for all of a session's.
-  FatePen(FateRing* ring, std::string_view backend) : _ring(ring), _backend(wire::numberOfBackend(backend)) {}
+  FateWriter(FateRing* ring, std::string_view backend)
+      : _ring(ring), _backend(wire::numberOfBackend(backend)) {}
 
   bool writes() const { return _ring != nullptr; }
   // Null if it writes nothing.

@@ -23,10 +23,10 @@ struct SpoolPlace;
 
 namespace veltrad::backends {
 
-class SpoolNotes {
+class SpoolRecorder {
  public:
   // Both must outlive it; `fates` may be null.
-  SpoolNotes(config::OwnerGate& gate, platform::FateRing* fates) : _gate(gate), _fates(fates) {}
+  SpoolRecorder(config::OwnerGate& gate, platform::FateRing* fates) : _gate(gate), _fates(fates) {}
 
   bool keepsRecords() const;
   // Records a post that has ended for good after so many transmissions, as one record.

@@ -10,10 +10,10 @@
 
 namespace veltrad::platform {
 
-class WakeWatch {
+class NetworkWatch {
  public:
   // While there is no netlink socket, only waking is noticed.
-  WakeWatch();
+  NetworkWatch();
 
   // To be polled for reading; negative: there is none.
   int descriptor() const { return _routes.get(); }

@@ -13,15 +13,15 @@
 
 namespace veltrad::session {
 
-class HeardWord {
+class OwnerFilter {
  public:
   // The gate must outlive it.
-  explicit HeardWord(const config::OwnerGate& gate) : _gate(gate) {}
+  explicit OwnerFilter(const config::OwnerGate& gate) : _gate(gate) {}
 
   // If the owner's decision has changed, takes it over and calls `obey`, until it stays the same. If `obey`
   // throws, the next call tries again.
   void hear(const std::function<void()>& obey);
-  const config::OwnersWord& now() const { return *_word; }
+  const config::OwnerDecision& now() const { return *_decision; }
   // If the identifiers were reset since the decision before, reads the device's identifier again and makes
   // the back ends read theirs. The back ends also read the consent again if the policy requires it. `set` may
   // be null.
@@ -37,7 +37,7 @@ class HeardWord {
   const config::OwnerGate& _gate;
   std::uint64_t _heard = 0;
   bool _reset = false;
-  std::shared_ptr<const config::OwnersWord> _word = std::make_shared<const config::OwnersWord>();
+  std::shared_ptr<const config::OwnerDecision> _decision = std::make_shared<const config::OwnerDecision>();
 };
 
 }  // namespace veltrad::session
