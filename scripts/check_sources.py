@@ -1,6 +1,6 @@
 # SPDX-License-Identifier: Apache-2.0
-"""Checks license, format, include ladder, file sizes, code that must not compile, and clang-tidy. Prints each problem with its
-place; the exit status is 1 if there is any."""
+"""Checks license, format, include ladder, sizes of files, functions and classes, code that must not compile, and clang-tidy. Prints each
+problem with its place; the exit status is 1 if there is any."""
 import collections
 import concurrent.futures
 import json
@@ -19,6 +19,8 @@ RUNG_OF = {room: number for number, rung in enumerate(RUNGS) for room in rung}
 KINDS = ["https", "dashboard", "upload", "mivo", "ampery"]
 LONGEST_BODY = 380
 LONGEST_HEADER = 300
+LONGEST_FUNCTION = 50
+MOST_FIELDS = 12
 LARGEST_UNIT = 24
 LICENSE_LINE = "SPDX-License-Identifier: Apache-2.0"
 COMMENT_OF = {".cpp": ("//", ""), ".h": ("//", ""), ".hpp": ("//", ""), ".c": ("/*", " */"), ".py": ("#", ""),
@@ -91,13 +93,69 @@ def check_ladder():
     return found
 
 
+def long_functions(lines):
+    """The first lines of blocks that are too long, by the layout that clang-format gives them."""
+    for end, line in enumerate(lines):
+        indent = len(line) - 1
+        if line == " " * indent + "}":
+            begin = next(i for i in range(end - 1, -1, -1) if re.match(rf" {{{indent}}}[^ }}#/]", lines[i]))
+            if end - begin >= LONGEST_FUNCTION:
+                yield begin + 1, end - begin + 1
+
+
+def fields_of(body):
+    """The names of the fields that the lines of a class's body declare."""
+    text = re.sub(r"//.*|^ *(public|private|protected):$", "", "\n".join(body), flags=re.M)
+    statements, statement, depth = [], "", 0
+    for character in text:
+        depth += (character == "{") - (character == "}")
+        if depth == 0:
+            statement += character
+        # A function ends with its body, everything else with a semicolon.
+        if depth == 0 and (character == ";" or character == "}" and re.search(r"\)[^()=]*\}$", statement)
+                           and not re.search(r"(GUARDED_BY\(\w+\)|_LOCK|function<.*>)[^()]*\}$", statement, re.S)):
+            statements.append(" ".join(statement.rstrip(";").split()))
+            statement = ""
+    fields = []
+    for statement in statements:
+        head = re.sub(r"\b(GUARDED_BY\(\w+\)|[A-Z_]+_LOCK\b)|=.*|\}", "", statement)
+        while "<" in head and head != (shorter := re.sub(r"<[^<>]*>", "", head)):
+            head = shorter
+        if head and not re.search(r"\(|\boperator\b|^(using|friend|static|enum|template|class|struct|union)\b", head):
+            fields += head.split(",")
+    return fields
+
+
+def large_classes(lines):
+    """The first lines of classes with many fields whose comment does not say how many and why."""
+    for begin, line in enumerate(lines):
+        match = re.match(r"( *)(class|struct) \w[^;]*$", line)
+        first = next((i for i in range(begin, len(lines)) if lines[i].endswith(("{", ";"))), None) if match else None
+        if first is None or lines[first].endswith(";"):
+            continue
+        end = next((i for i in range(first, len(lines)) if lines[i].startswith(match[1] + "}")), len(lines))
+        count, comment, above = len(fields_of(lines[first + 1:end])), "", begin - 1
+        while above >= 0 and re.match(r" *(//|template)", lines[above]):
+            comment, above = lines[above].strip(" /") + " " + comment, above - 1
+        said = re.search(r"Its (\d+) fields", comment)
+        if int(said[1]) != count if said else count > MOST_FIELDS:
+            yield begin + 1, count
+
+
 def check_size():
     found = []
     for path in sources(".cpp", ".h", ".hpp"):
-        lines = len(path.read_text().splitlines()) - 1  # without that of the license
+        if path.relative_to(ROOT).parts[0] != "src":
+            continue
+        lines = path.read_text().splitlines()[1:]  # without that of the license
+        name = path.relative_to(ROOT)
         bound = LONGEST_BODY if path.suffix == ".cpp" else LONGEST_HEADER
-        if path.relative_to(ROOT).parts[0] == "src" and lines > bound:
-            found.append(f"{path.relative_to(ROOT)}: {lines} lines, more than {bound}; look for the second class in it")
+        if len(lines) > bound:
+            found.append(f"{name}: {len(lines)} lines, more than {bound}; look for the second class in it")
+        found += [f"{name}:{begin + 1}: a function of {length} lines, more than {LONGEST_FUNCTION}; divide it"
+                  for begin, length in long_functions(lines)]
+        found += [f"{name}:{begin + 1}: {count} fields; a class of more than {MOST_FIELDS} says \"Its {count} fields\", and why"
+                  for begin, count in large_classes(lines)]
     return found
 
 

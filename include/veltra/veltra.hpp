@@ -150,6 +150,7 @@ struct Aggregated {
 };
 
 // Absent values are left out of the description of the session.
+// Its 16 fields are those of veltra_session_options.
 struct Options {
   // 0 to 17: a ClientType.
   std::optional<std::int32_t> clientType = {};

@@ -12,15 +12,15 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/backend_state_recorder.h"
 #include "backends/client_match.h"
 #include "backends/lock_ranks.h"
 #include "backends/session_facts.h"
-#include "backends/standing_record.h"
 #include "base/mutex.h"
 #include "base/value.h"
 #include "platform/clock.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "platform/random.h"
 #include "wire/error.h"
 #include "wire/fates.h"
@@ -38,37 +38,37 @@ enum BackendState : std::int32_t {
   kBackendHeld = 3,
 };
 
-// A state and why. Aligned so that the two change in one indivisible store.
+// A state and its reason. Aligned so that both change in one atomic store.
 struct alignas(8) StateVerdict {
   std::int32_t state = kBackendWaiting;
   wire::Reason reason = wire::Reason::waits_for_user_info;
 };
 
-// What a back end has to do with its messages just now.
+// The messages that a back end currently handles.
 struct BackendActivity {
   std::size_t held = 0;      // events that wait for a flush, datagrams that wait for the socket
   std::size_t underWay = 0;  // posts without an answer, datagrams without an acknowledgement
   std::string lastOutcome;   // of the last post: "HTTP 200", a transport's text; empty: none
 };
 
-// What a back end has decided for a message, and the text about what it has sent, if there is one.
+// A back end's decision on a message, and the readable text of what it has sent, if any.
 struct Sent {
   wire::Decision decision;
   std::optional<std::string> text;
 };
 
-// What is known of a message before any back end has it.
+// The data of a message before it reaches a back end.
 struct MessageNote {
-  // What the owner keeps back of the payload; null: nothing. Valid during the call.
+  // The fields of the payload that the owner withholds; null if none. Valid during the call.
   const config::EditedFields* edits = nullptr;
-  // In the record of fates; 0: it is in none.
+  // The number in the record of fates; 0 if it is not recorded.
   std::uint64_t number = 0;
-  // Where the record tells of its session.
+  // The entry of its session in the record.
   wire::FateRef session = 0;
 };
 
 struct NumberedMessage {
-  // Without what the owner of the device keeps back.
+  // Without the fields that the owner of the device withholds.
   std::optional<Dictionary> payload;
   platform::TimeValue timestamp;
   std::uint16_t method = 0;
@@ -78,8 +78,8 @@ struct NumberedMessage {
   MessageNote note = {};
 };
 
-// One back end of one session. It outlives its session only while its own work is under way. Its 15 fields
-// are what every kind has: what it is, how it stands, what it knows of its session, and what is told of it.
+// One back end of one session. It outlives its session only until its own work is done. Its 15 fields are
+// common to all kinds: its name, state, facts of the session, and record of fates.
 class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
  public:
   // Gets an optional result text and an optional error. Called exactly once, possibly on another thread.
@@ -91,9 +91,9 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // Lower-case hexadecimal SHA-256 of the text's UTF-8 bytes, 64 characters.
   static std::string convertIntoSHA256(std::string_view text);
 
-  // Goes on where the one of the same name stopped that the session had before: its event number, and what
-  // waits in its batch. Called before the first message and before other threads know the back end; the other
-  // sends nothing from then on.
+  // Continues the session's previous back end of the same name: takes its event number and its batch. Called
+  // before the first message and before other threads know this back end; the previous one sends nothing from
+  // then on.
   virtual void takeOver(VeltraBackend& before) { _eventID = before._eventID; }
   // Called before the session releases the back end.
   virtual void cleanup() {}
@@ -111,11 +111,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
                                 const MessageNote& note);
   virtual bool uploadLogData(const Array& logData, const MessageNote& note);
   virtual void setCorrelatedSessionID(const std::string& sessionID);
-  // The device has another identifier, and the back end makes others of its own.
+  // Takes the device's new identifier, and replaces the back end's own identifiers.
   virtual void takeIdentity(const std::string& udid);
-  // The owner has given or withdrawn consent where the policy asks for it on open sessions, too.
+  // Reads the consent again, because the policy requires consent for open sessions, too.
   virtual void rereadConsent() {}
-  // Drops what waits and bears the device's identifier. Any thread.
+  // Drops waiting data that contains the device's identifier. Any thread.
   virtual void dropIdentified() {}
 
   // Constant after construction.
@@ -124,9 +124,9 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   // In [0, 1), drawn once.
   double samplingFactor() const { return _samplingFactor; }
   const std::optional<std::string>& displayURL() const { return _displayURL; }
-  // Called before the first message: what becomes of messages is written there. Null: nowhere.
+  // Sets the ring for the record of fates, before the first message; may be null.
   void keepFates(platform::FateRing* ring) { _pen = {ring, _name}; }
-  const platform::FatePen& pen() const { return _pen; }
+  const platform::FateWriter& pen() const { return _pen; }
 
   // Any thread. Never null; a change of the facts does not affect those that a caller already has.
   SharedFacts facts() const;
@@ -138,7 +138,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
     const auto forbidden = prohibition();
     return forbidden ? StateVerdict{kBackendDisabled, *forbidden} : ownVerdict();
   }
-  // The same without the owner's word.
+  // The state without the owner's decision.
   StateVerdict ownVerdict() const { return _state.load(std::memory_order_relaxed); }
   void setState(StateVerdict verdict) { _state.store(verdict, std::memory_order_relaxed); }
   std::int32_t hierarchy() const { return _hierarchy.load(std::memory_order_relaxed); }
@@ -146,7 +146,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   std::optional<double> samplingThreshold() const;
   void setSamplingThreshold(std::optional<double> value);
   virtual BackendActivity activity() const;
-  // Why the owner of the device does not let it report; nothing: it may.
+  // Why the owner of the device forbids it to report; absent if it may.
   std::optional<wire::Reason> prohibition() const {
     const int reason = _prohibition.load(std::memory_order_relaxed);
     return reason < 0 ? std::nullopt : std::optional(static_cast<wire::Reason>(reason));
@@ -157,7 +157,7 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   virtual std::vector<std::string> hosts() const { return {}; }
   // False if updateState() may change the hosts, so that no other thread may ask for them.
   virtual bool hostsAreFixed() const { return true; }
-  // A post begins; it ended so.
+  // A post begins; a post has ended with this result.
   void postBegins() { _postsUnderWay.fetch_add(1, std::memory_order_relaxed); }
   void postEnded(std::string outcome);
 
@@ -169,11 +169,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   void setDisplayURL(std::optional<std::string> value) { _displayURL = std::move(value); }
   // The session's thread.
   virtual ClientMatch clientMatch() const { return {}; }
-  // What the record is to say of a step of the message, with how the back end stands. The session's thread.
+  // An entry of the record for a step of the message, with the state of the back end. The session's thread.
   wire::StepEntry stepOf(const NumberedMessage& message);
   // The same for a file or log data.
   wire::StepEntry stepOf(const MessageNote& note);
-  // Writes down a decision after which nothing more becomes of the message here.
+  // Records the final decision on the message in this back end.
   Sent settled(const NumberedMessage& message, wire::Decision decision);
 
  private:
@@ -184,11 +184,11 @@ class VeltraBackend : public std::enable_shared_from_this<VeltraBackend> {
   const std::string _productFamily;
   const double _samplingFactor;
   std::optional<std::string> _displayURL;
-  platform::FatePen _pen;
+  platform::FateWriter _pen;
 
   // The session's thread only.
   std::uint16_t _eventID = 0;
-  StandingRecord _standing;
+  BackendStateRecorder _standing;
 
   std::atomic<StateVerdict> _state{StateVerdict()};
   std::atomic<int> _prohibition{-1};  // a reason; negative: none

@@ -9,7 +9,6 @@
 #include "backends/sampling_factors.h"
 #include "backends/upload/upload_backend.h"
 #include "platform/log.h"
-#include "platform/random.h"
 #include "wire/constants.h"
 
 namespace veltrad::backends {
@@ -18,7 +17,7 @@ namespace {
 // Devices of this product type have no adaptor.
 [[maybe_unused]] constexpr const char* kProductTypeWithoutMivo = "Halvorn";
 
-// The one draw that a back end takes, decided before.
+// A random source that returns the sampling factor decided before.
 class FixedDraw final : public platform::Random {
  public:
   explicit FixedDraw(double draw) : _draw(draw) {}

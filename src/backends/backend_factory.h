@@ -16,6 +16,7 @@
 #include "platform/lent_files.h"
 #include "platform/locale.h"
 #include "platform/preferences.h"
+#include "platform/random.h"
 #include "support/device_identity.h"
 #include "support/veltra.h"
 
@@ -30,8 +31,8 @@ class EnergyLog;
 class SamplingFactors;
 class WorkPool;
 
-// Its 19 fields are what all kinds of back ends use; the factory passes to each kind only what that kind
-// needs. All of it outlives the back ends.
+// Its 19 fields are the services of all kinds of back ends; the factory passes to each kind only those that
+// it needs. All must outlive the back ends.
 struct BackendServices {
   http::HTTPClient& http;
   platform::Clock& clock;
@@ -49,13 +50,13 @@ struct BackendServices {
   platform::LentFiles& lentFiles;
   // Where temporary files are made.
   std::string scratchDirectory = "/tmp";
-  // Null: every sampling factor is drawn.
+  // If null, every sampling factor is drawn.
   SamplingFactors* sampling = nullptr;
-  // Null: the owner sets no limits.
+  // If null, the owner sets no limits.
   config::OwnerGate* gate = nullptr;
-  // Null: what becomes of messages is not recorded.
+  // If null, the fates of messages are not recorded.
   platform::FateRing* fates = nullptr;
-  // Null: posts that fail are lost.
+  // If null, failed posts are lost.
   PostSpool* spool = nullptr;
 };
 
@@ -75,17 +76,17 @@ class BackendFactory {
                                                     const std::optional<std::string>& productFamily,
                                                     const SharedFacts& facts, bool oneShot = false,
                                                     const std::optional<double>& draw = std::nullopt);
-  // The one reason for which a kind of back end is not made, other than that something was short.
+  // Why a back end of this kind is not made, apart from shortages.
   static wire::Reason whyNotMade(std::string_view name);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest() { _posts.sayRest(); }
   // Frees memory that is kept for the next message. Called when nothing was sent for a while.
   void rest() { _posts.rest(); }
-  // Drops what waits for dashboards after its session. `refuses`: whether a host may not be reached.
+  // Drops datagrams that outlive their sessions. `refuses`: whether a host may not be contacted.
   void dropWaiting(const std::function<bool(const std::string& host)>& refuses) {
     _dashboards->dropWaiting(refuses);
   }
-  // Whose files wait for a place or are being compressed.
+  // The clients whose files wait for a place or are being compressed.
   FileUploads::Preparing preparingFiles() { return _files.preparing(); }
 
  private:

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which client entry of a storebag's section holds for a back end.
+// The client entry of a storebag's section that applies to a back end.
 #pragma once
 
 #include <cstddef>
@@ -7,7 +7,7 @@
 
 namespace veltrad::backends {
 
-// The entry that fits, by its place; if none does, the nearest one, and what of it does not fit.
+// The index of the matching entry; if there is none, the nearest entry, and the conditions that do not match.
 struct ClientMatch {
   std::optional<std::size_t> entry = std::nullopt;
   std::optional<std::size_t> nearest = std::nullopt;

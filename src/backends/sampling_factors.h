@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Sampling factors that are the same after every start. Any thread.
+// Stable sampling factors, the same after every start. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -21,13 +21,13 @@ namespace veltrad::backends {
 // and the back end's name.
 double stableSamplingFactor(std::string_view secret, std::string_view storebag, std::string_view backend);
 
-// What the constructor takes outlives it.
+// The constructor's arguments must outlive it.
 class SamplingFactors {
  public:
   SamplingFactors(config::OperatorSettings& settings, platform::DeviceSecret& secret)
       : _settings(settings), _secret(secret) {}
 
-  // Nothing: the factor is drawn, because that was chosen or because the secret cannot be read just now.
+  // Nothing: the factor is drawn, because that was chosen or because the secret cannot be read at the moment.
   std::optional<double> stableFactor(std::int32_t clientType, const std::string& backend);
 
  private:

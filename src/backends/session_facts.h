@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session tells its back ends about itself, its client and the device.
+// The facts about a session, its client and the device that its back ends use.
 #pragma once
 
 #include <cstdint>
@@ -49,6 +49,7 @@ struct UserInfo {
 };
 
 // The pointers may be null.
+// Its 16 fields are all that back ends read of their session.
 struct SessionFacts {
   DeviceFacts device;
   SelfVersion selfVersion;
@@ -65,13 +66,13 @@ struct SessionFacts {
   double startTimeStamp = 0;
   // As the client gave it: it chooses the client entry and the family, and does not leave the device.
   SharedDictionary userInfo;
-  // The same without what the owner of the device keeps back: this may leave.
+  // The user info that may leave: without the fields that the owner of the device withholds.
   SharedDictionary sentUserInfo;
-  // What of the user info differs between the two.
+  // The differences between the two.
   config::SharedEdits userInfoEdits;
-  // Whose messages these are, for the owner of the device; made of the fields above.
+  // The description of the client for the owner of the device, made of the fields above.
   SharedDictionary client;
-  // What the back ends were made from: {"name", "version", "section"}.
+  // The storebag of the back ends: {"name", "version", "section"}.
   SharedDictionary storebag;
   std::optional<std::string> combinedSessionIDString;
   // Pays for what is kept.
@@ -89,7 +90,7 @@ using SharedFacts = std::shared_ptr<const SessionFacts>;
 std::uint32_t connectionNumber(std::string_view sessionIDString);
 // {"clientType", "sessionID", "client", "service"}; names that may not leave are not among them.
 SharedDictionary clientOf(const SessionFacts& facts);
-// What else the history of what left says of it: {"backend", "storebag", "entry", "removed", "hashed"}.
+// The other fields of a departure in the history: {"backend", "storebag", "entry", "removed", "hashed"}.
 // `entry`: the number of the client entry, counted from 0.
 Dictionary aboutDeparture(const std::string& backend, const SessionFacts& facts,
                           std::optional<std::size_t> entry, const config::EditedFields& edits);

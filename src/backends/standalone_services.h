@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What back ends use, made over a machine that the caller brings: for tools that play storebags, and for
-// tests. The daemon makes its own (daemon/services.h).
+// The services of back ends over a machine that the caller provides: for tools that evaluate storebags, and
+// for tests. The daemon has its own (daemon/services.h).
 #pragma once
 
 #include "backends/ampery/energy_log.h"
@@ -18,7 +18,7 @@
 
 namespace veltrad::backends {
 
-// All of it outlives what is made over it.
+// All of it must outlive the services.
 struct Machine {
   http::HTTPClient& http;
   platform::Clock& clock;

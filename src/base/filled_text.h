@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Texts with values in them, without a library: what libveltra links is loaded into every program that
-// reports.
+// Formats texts without a library, because every library that libveltra links is loaded into every program
+// that reports.
 #pragma once
 
 #include <concepts>

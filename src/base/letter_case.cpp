@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The functions of text.h that need Unicode's tables. A file of their own, since libveltra needs neither.
+// The functions of text.h that need Unicode's tables, in a separate file because libveltra does not need
+// them.
 #include <utf8proc.h>
 
 #include <algorithm>

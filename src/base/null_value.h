@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What is absent or not known, as a value that JSON writes as null.
+// The value for absent or unknown data, which JSON writes as null.
 #pragma once
 
 #include <limits>
@@ -12,7 +12,7 @@ inline Value nullValue() {
   return std::numeric_limits<double>::quiet_NaN();
 }
 
-// What it points to, or null.
+// The value that the pointer refers to, or null.
 template <typename T>
 Value orNull(const T& value) {
   return value ? Value(*value) : nullValue();

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a binary property list declares in its trailer, and the number of objects in a value.
+// Parses the trailer of binary property lists, and counts the objects in a value.
 #include "base/property_list.h"
 #include "base/filled_text.h"
 

@@ -17,7 +17,7 @@ namespace veltrad::binary_property_list {
 inline constexpr std::string_view kHeader = "bplist00";
 inline constexpr std::size_t kTrailerSize = 32;
 
-// Whole markers.
+// Markers that fill the whole byte.
 inline constexpr std::uint8_t kNull = 0x00;
 inline constexpr std::uint8_t kFalse = 0x08;
 inline constexpr std::uint8_t kTrue = 0x09;

@@ -55,7 +55,7 @@ struct TextPlace {
   std::size_t line = 1;
   std::size_t column = 1;
 };
-// Of the byte at `offset`; of the end for one beyond it. Lines end at "\n".
+// The place of the byte at `offset`, or of the end if `offset` is beyond it. Lines end at "\n".
 TextPlace placeInText(std::string_view text, std::size_t offset);
 
 // Without the characters of `blanks` at either end.

@@ -204,11 +204,11 @@ inline Dictionary::const_iterator Dictionary::end() const {
   return begin() + size();
 }
 
-// What malloc uses for a block of this many bytes; 0 for none.
+// The memory that malloc uses for a block of this size; 0 for 0 bytes.
 constexpr std::size_t blockBytes(std::size_t bytes) {
   return bytes == 0 ? 0 : bytes <= 24 ? 32 : (bytes + 8 + 15) / 16 * 16;
 }
-// What make_shared allocates: the object and its two counts.
+// The memory that make_shared allocates: the object and its two counts.
 template <typename T>
 constexpr std::size_t sharedBytes() {
   return blockBytes(sizeof(T) + 2 * sizeof(void*));

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The only file that is compiled again when the version changes.
+// Defined here so that a change of the version recompiles only this file.
 #include "base/version.h"
 
 namespace veltrad {

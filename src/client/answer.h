@@ -20,13 +20,13 @@ struct veltra_reply {
   std::optional<std::string> text;
   veltrad::client::ValuePointer backends;
   std::optional<veltrad::Value> outcomes;
-  // Made of them by the first question for them, which few callers ask.
+  // Built on the first request, because few callers need them.
   mutable std::once_flag outcomesAsked;
   mutable veltrad::client::ValuePointer outcomesNode;
   bool uploaded = false;
   bool removed = false;
   std::optional<veltrad::wire::ReportingError> error;
-  // Of an upload that is not settled.
+  // The file of an upload that is not settled yet.
   std::shared_ptr<veltrad::client::UploadedFile> file;
 };
 

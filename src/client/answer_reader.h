@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads what the daemon sends. Used by one thread at a time, without a lock.
+// Reads and parses the frames of the daemon. Used by one thread at a time, without a lock.
 #pragma once
 
 #include <cstdint>
@@ -20,9 +20,9 @@ struct Arrived {
   Kind kind;
   std::uint32_t callID = 0;
   Answer answer = nullptr;
-  // Of an event.
+  // The body of an event.
   Dictionary event = {};
-  // Of a refusal, and of a greeting that is none.
+  // Set for a refusal, and for a hello that cannot be used.
   std::optional<ConnectFailure> failure = {};
 };
 
@@ -34,12 +34,12 @@ class AnswerReader {
   // `path` is for error texts.
   explicit AnswerReader(std::string path) : _path(std::move(path)) {}
 
-  // For the next connection. `frames` may already hold frames; `greeted` says that the daemon's hello is not
-  // to come.
+  // Starts reading from the next connection. `frames` may already hold frames; `greeted` says that the
+  // daemon's hello was already received.
   void restart(wire::FrameReader frames, bool greeted);
   // Receives once, with these flags. What has arrived before is parsed first, instead.
   Got receive(int socket, int flags);
-  // What has arrived, in order. The caller empties it.
+  // The arrived frames, in order. The caller empties the vector.
   std::vector<Arrived>& arrived() { return _arrived; }
 
  private:

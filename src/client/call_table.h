@@ -32,7 +32,7 @@ struct Waiter {
 struct StateChange {
   veltra_connection_state state;
   ValuePointer backends;
-  // Null if there is nothing to say.
+  // Null if no reason is known.
   std::optional<std::string> why;
 };
 
@@ -45,7 +45,7 @@ class CallTable {
     Waiter* waiter = nullptr;
     veltra_callback callback = nullptr;
     void* context = nullptr;
-    // Of an upload.
+    // The file of an upload.
     std::shared_ptr<UploadedFile> file;
 
     bool awaitsAnswer() const { return waiter || callback || file; }

@@ -21,7 +21,7 @@ struct CallFrame {
   // VELTRA_OK, VELTRA_INVALID or VELTRA_TOO_LARGE; there is no call unless it is VELTRA_OK.
   veltra_status status;
   OutCall call = {};
-  // What is wrong with an argument, if the status does not say enough.
+  // Describes the wrong argument, if the status alone is not enough.
   std::string problem = {};
 };
 

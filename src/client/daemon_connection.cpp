@@ -98,7 +98,7 @@ Answer DaemonConnection::sendAndWait(OutCall call) {
   return std::move(waiter.answer);
 }
 
-// Waits until the answer is there, or the caller is to read.
+// Waits until the answer has arrived, or until the caller gets the reader's role.
 DaemonConnection::Turn DaemonConnection::waitForTurn(Waiter& waiter, Clock::time_point deadline) {
   Lock lock(_lock);
   while (!waiter.answer) {
@@ -136,7 +136,7 @@ void DaemonConnection::readUntilAnswered(const Waiter& waiter, Turn turn) {
 
 // ---- Reading ----
 
-// What the role's holder has received.
+// Handles what the holder of the role has received.
 void DaemonConnection::handle(AnswerReader::Got got) {
   const bool idle = !_exchange.calls().anyReady();
   _exchange.take(_reader.arrived());

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A session's way to the daemon. Any thread may make calls; callbacks run on its own thread.
+// The connection of a session to the daemon. Any thread may make calls; callbacks run on the connection's own
+// thread.
 #pragma once
 
 #include <atomic>
@@ -24,12 +25,11 @@
 
 namespace veltrad::client {
 
-// Sends calls to the daemon in the order in which they were made, ends each exactly once, and connects again
-// when the connection has ended.
+// Sends calls to the daemon in order, ends each exactly once, and reconnects when the connection has ended.
 //
 // Its thread connects, reads if no waiting thread does (ReaderRole), and runs callbacks, without a lock. It
-// is started by the first call that needs it. What is to be sent and what has come is in the Exchange; this
-// class is the threads and the lock around it.
+// is started by the first call that needs it. The Exchange holds what is to be sent and what was received;
+// this class adds the threads and the lock.
 //
 // After close() no other call may start. Waiting threads share the ownership, because they may still use the
 // object after their answer has arrived. In a forked child only forked() and abandon() may be called.
@@ -51,7 +51,7 @@ class DaemonConnection {
   }
   veltra_statistics statistics();
   std::uint64_t counter(veltra_counter which);
-  // See veltra_session_close. Returns the number of lost calls that no counter has told.
+  // See veltra_session_close. Returns the number of lost calls that no counter has reported yet.
   std::uint64_t close();
 
   // The process is a forked child of the one that the session belongs to.
@@ -64,7 +64,7 @@ class DaemonConnection {
   using Clock = Reconnection::Clock;
   using Phase = Exchange::Phase;
   enum class Stopping { no, draining, ending };
-  // What a waiting thread that reads does next.
+  // The next step of a waiting thread: whether it reads, and from which socket.
   struct Turn {
     bool reads;
     int socket = -1;
@@ -100,12 +100,12 @@ class DaemonConnection {
   const ForkMark _process;
   std::atomic<std::thread::id> _ownThread{};
 
-  // Used only by whoever has the role.
+  // Used only by the thread that holds the role.
   AnswerReader _reader;
 
   Mutex _lock LEAF_LOCK{LockRank::leaf};
   Condition _progress;  // of close()
-  // What the thread waits for; only waiting for it is done without the lock.
+  // The events for which the thread waits; only the wait itself is done without the lock.
   SocketWatch _watch;
   Thread _thread GUARDED_BY(_lock);
   ReaderRole _role GUARDED_BY(_lock);

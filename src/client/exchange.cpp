@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What happens to calls when connections come and go.
+// Handles calls, answers, and the begin and end of connections.
 #include "client/exchange.h"
 
 #include <sys/random.h>
@@ -76,7 +76,7 @@ void Exchange::adopt(FileDescriptor socket) {
 }
 
 void Exchange::attempted(FileDescriptor socket) {
-  const SessionStanding& standing = _record.standing();
+  const SessionDescription& standing = _record.standing();
   _socket = std::move(socket);
   _wish.attempted(Reconnection::Clock::now());
   if (standing.described()) _record.calls().add(0, false);
@@ -117,8 +117,8 @@ void Exchange::started(const veltra_reply& answer) {
 
 void Exchange::ended(bool reset) {
   if (!connected()) return;
-  // After its own half of the connection is closed, a daemon that has run everything ends the other half
-  // without a word.
+  // After this end has closed its half, a daemon that has run everything closes the other half without a
+  // frame.
   if (_closing == Closing::halfClosed && !reset && _lastWords.empty()) _record.calls().allRan();
   disconnect(_lastWords.empty() ? kNoWords : _lastWords);
 }

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// One session's calls and answers over the connections that it has, one after the other.
+// The calls and answers of one session, over all its successive connections.
 #pragma once
 
 #include <chrono>
@@ -19,7 +19,7 @@
 namespace veltrad::client {
 
 struct ConnectionOptions {
-  // Of the daemon's socket.
+  // The path of the daemon's socket.
   std::string path;
   // The time that a daemon has to greet, and that a waiting call waits for a connection.
   std::chrono::milliseconds patience;
@@ -29,9 +29,10 @@ struct ConnectionOptions {
   std::function<void(const StateChange&)> state;
 };
 
-// Joins the four parts of a session: what is to be written, the calls under way, what has arrived, and the
-// wish to be connected. Used under its connection's lock; nothing here waits. Whoever reads the socket also
-// reports its end, so that answers and a "goodbye" that came before the end are not lost.
+// Combines the four parts of a session: writing (OutFrames), open calls (CallTable), the record of what was
+// sent (SentRecord), and reconnecting (Reconnection). Used under its connection's lock; never waits. The
+// thread that reads the socket also reports its end, so that answers and a "goodbye" before the end are not
+// lost.
 class Exchange {
  public:
   using Phase = Reconnection::Phase;
@@ -41,10 +42,10 @@ class Exchange {
 
   // A connection on which the hellos and the description were exchanged.
   void adopt(FileDescriptor socket);
-  // What a due attempt has led to: a connected socket, on which everything is still to be said.
+  // Takes the connected socket of an attempt, on which no frame was sent yet.
   void attempted(FileDescriptor socket);
   void attemptFailed(const std::string& why);
-  // The daemon's hello is overdue.
+  // The daemon's hello did not arrive in time.
   void greetingFailed();
 
   // Sends the call, or lets it wait. A waiter gets the call's ID.
@@ -60,7 +61,7 @@ class Exchange {
 
   // No more calls are taken; what waits is still to be written.
   void beginClosing();
-  // There is nothing left to write or to learn.
+  // True if nothing is left to write and no answer is expected.
   bool drained() const;
   void finish();
 
@@ -70,7 +71,7 @@ class Exchange {
   CallTable& calls() { return _calls; }
   int socket() const { return _socket.get(); }
   bool writing() const { return _out.writing(); }
-  // Something is expected that no waiting thread reads.
+  // True if frames are expected that no waiting thread reads.
   bool expectsFrames() const;
   // In a forked child: closes its copy of the socket.
   void abandon() { _socket.reset(); }
@@ -102,7 +103,7 @@ class Exchange {
   // The last call that starts the session; 0 if there is none.
   std::uint32_t _startID = 0;
   std::uint64_t _connections = 0;
-  // What the daemon has said about the end that follows.
+  // The description in the daemon's refusal or "goodbye" that precedes the end.
   std::string _lastWords;
   Closing _closing = Closing::no;
 };

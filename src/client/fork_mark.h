@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Tells the process that made it from the children that it forks.
+// Detects whether the current process is a forked child of the process that made this object.
 #pragma once
 
 #include <sys/types.h>

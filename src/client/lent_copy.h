@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Copies a file for the daemon, which does not take files of network or FUSE file systems.
+// Copies a file for the daemon, which does not accept files of network or FUSE file systems.
 #pragma once
 
 #include <sys/types.h>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What libveltra exports to programs that were built with 8.0. Not in the room: only a shared object has
-// versions of a symbol.
+// Symbols that libveltra exports to programs built with 8.0. Not part of the room, because only a shared
+// object has symbol versions.
 #include <cstring>
 
 #include "client/session_options.h"

@@ -14,8 +14,8 @@
 
 namespace veltrad::client {
 
-// Keeps calls in order and writes them without blocking. A call waits until its last byte is written; what no
-// connection has taken any byte of waits for the next one.
+// Keeps calls in order and writes them without blocking. A call waits until its last byte is written. A call
+// of which no byte was written waits for the next connection.
 class OutFrames {
  public:
   // At most `most` bytes may wait, or one larger call. `record` must outlive it.
@@ -43,7 +43,7 @@ class OutFrames {
   veltra_status refuse(veltra_status why);
   // Writes as much as possible of what waits.
   void writeWaiting();
-  // Takes back a call. False if it does not wait, or a part of it was written.
+  // Removes a waiting call. False if it is not waiting, or if a part of it was written.
   bool withdraw(std::uint32_t callID);
 
   bool empty() const { return _calls.empty() && _first.empty(); }
@@ -66,7 +66,7 @@ class OutFrames {
   const std::size_t _most;
   SentRecord& _record;
   bool _closed = false;
-  // apart: nothing is written. first: what comes before the calls.
+  // apart: nothing is written. first: the frames before the calls.
   Gate _gate = Gate::apart;
   int _socket = -1;
   std::string _first;

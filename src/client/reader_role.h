@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which thread reads a connection's socket. Used under its connection's lock.
+// Assigns the reading of a connection's socket to one thread at a time. Used under its connection's lock.
 #pragma once
 
 #include <vector>
@@ -9,8 +9,8 @@
 namespace veltrad::client {
 
 // One thread at a time reads. A thread that waits for its own answer reads itself if nobody does, which makes
-// such a call as fast as an exchange on the bare socket; the others park here until they have their answers
-// or the role is passed to them. If nobody waits, the connection's thread reads.
+// such a call as fast as an exchange on the bare socket. The other waiting threads block here until they have
+// their answers or get the role. If no thread waits, the connection's thread reads.
 class ReaderRole {
  public:
   enum class Holder { nobody, waiter, ownThread };
@@ -25,7 +25,7 @@ class ReaderRole {
 
   void park(Waiter& waiter) { _parked.push_back(&waiter); }
   void unpark(Waiter& waiter) { std::erase(_parked, &waiter); }
-  // False if nobody is parked.
+  // False if no thread is blocked here.
   bool wakeOne() {
     if (_parked.empty()) return false;
     _parked.front()->changed.notifyOne();

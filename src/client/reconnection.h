@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether a session wants a connection, and when the next attempt to get one is due. Used under a lock.
+// The phases of connecting: whether a session needs a connection, and when the next attempt is due. Used
+// under a lock.
 #pragma once
 
 #include <chrono>
@@ -7,19 +8,18 @@
 
 namespace veltrad::client {
 
-// The states between two connections. It decides and does nothing itself: its user makes the attempts and
-// reports what came of them.
+// Only decides: its user makes the attempts and reports their results.
 class Reconnection {
  public:
   using Clock = std::chrono::steady_clock;
   using TimePoint = Clock::time_point;
 
   // waiting: there is no connection, and an attempt is due at nextStep(). greeting: connected, the daemon's
-  // hello must come before nextStep(). starting: the session is being started anew, so its calls still wait.
+  // hello must come before nextStep(). starting: the session is being started again, so its calls still wait.
   // open: calls are written. over: no connection is wanted any more, which is final.
   enum class Phase { waiting, greeting, starting, open, over };
 
-  // The wait before an attempt lies between these. It grows with each attempt that fails, and begins anew
+  // The wait before an attempt lies between these. It grows with each attempt that fails, and starts again
   // once the daemon has greeted.
   static constexpr std::chrono::milliseconds kShortestWait{100};
   static constexpr std::chrono::milliseconds kLongestWait{30'000};
@@ -35,7 +35,7 @@ class Reconnection {
 
   // The attempt has reached the socket.
   void attempted(TimePoint now);
-  // The daemon has sent its hello; `starts` says whether the session must be started anew.
+  // The daemon has sent its hello; `starts` says whether the session must be started again.
   void greeted(bool starts);
   void started();
   // The attempt failed, or the connection has ended. `draw` is a random number from 0 to 1, which spreads the

@@ -1,12 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session has written, and what it has lost. Used under its connection's lock.
+// Records what a session has written and counts what it has lost. Used under its connection's lock.
 #pragma once
 
 #include <cstdint>
 #include <memory>
 #include <string>
 
-#include "client/session_standing.h"
+#include "client/session_description.h"
 #include "client/uploaded_file.h"
 #include "client/written_calls.h"
 
@@ -32,22 +32,22 @@ class SentRecord {
   void cut(const OutCall& call);
   // It was accepted but will not be written.
   void dropped(const OutCall& call) { _lost += call.counted; }
-  // What is not known to have been run is lost.
+  // Counts the calls as lost that are not known to have been run.
   void connectionEnded();
 
   WrittenCalls& calls() { return _calls; }
   const WrittenCalls& calls() const { return _calls; }
-  SessionStanding& standing() { return _standing; }
-  const SessionStanding& standing() const { return _standing; }
+  SessionDescription& standing() { return _standing; }
+  const SessionDescription& standing() const { return _standing; }
   // Calls that were written, on all connections.
   std::uint64_t sent() const { return _sent; }
   std::uint64_t lost() const { return _lost; }
-  // Of the lost calls, those that nobody was told of yet.
+  // Returns the number of lost calls since the last call of this function.
   std::uint64_t tellLost();
   std::uint64_t untold() const { return _lost - _told; }
 
  private:
-  SessionStanding _standing;
+  SessionDescription _standing;
   WrittenCalls _calls;
   std::uint64_t _sent = 0;
   std::uint64_t _lost = 0;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads the options of a session, which a program may give in an earlier version of their struct.
+// Reads the options of a session, also from an earlier version of their struct.
 #pragma once
 
 #include <cstddef>
@@ -20,7 +20,7 @@ inline constexpr std::size_t kSizeOf80 =
 // if `size` is no version's size.
 std::optional<veltra_session_options> completeOptions(const veltra_session_options* given);
 
-// What is wrong with the description of a session, as a sentence; absent if nothing is.
+// The fault in the description of a session, as a sentence; absent if there is none.
 std::optional<std::string> problemOfDescription(const veltra_session_options& options);
 // The same for a message's flag.
 std::optional<std::string> problemOfFlag(std::uint32_t flag);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a connection's thread waits for: its socket, and other threads that wake it.
+// Waits for events of a connection's socket, and for other threads that wake the waiting thread.
 #pragma once
 
 #include <cstdint>
@@ -9,8 +9,7 @@
 
 namespace veltrad::client {
 
-// One thread waits. The other functions are used under the connection's lock, but wake(), which any thread
-// may call.
+// One thread waits. Any thread may call wake(); all other functions are used under the connection's lock.
 class SocketWatch {
  public:
   SocketWatch();

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What is known about the calls that were written on one connection. Used under its connection's lock.
+// Tracks which of the calls written on one connection the daemon has run. Used under its connection's lock.
 #pragma once
 
 #include <chrono>
@@ -9,7 +9,7 @@
 namespace veltrad::client {
 
 // The daemon runs the calls of a connection one at a time, in order. So an answer shows that its call and all
-// before it were run, and the daemon's "goodbye" says how many were. What lies beyond is uncertain.
+// before it were run, and the daemon's "goodbye" says how many were. The result of later calls is uncertain.
 class WrittenCalls {
  public:
   using TimePoint = std::chrono::steady_clock::time_point;
@@ -32,7 +32,7 @@ class WrittenCalls {
 
   // Counted calls that are not known to have been run.
   std::uint64_t uncertain() const { return _written - _ran - _uncounted.size(); }
-  // An answer that shows more is still to come.
+  // True if an answer that proves further calls run is still expected.
   bool awaitsAnswer() const { return !_asked.empty(); }
   // There is a new connection.
   void clear();

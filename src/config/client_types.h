@@ -18,7 +18,7 @@ inline constexpr std::int32_t kVeltraClientTypeCount = 18;
 const char* storebagNameForClientType(std::int32_t clientType);
 // The first client type that has this storebag.
 std::optional<std::int32_t> clientTypeWithStorebag(std::string_view name);
-// All, each once.
+// The names of all storebags, each once.
 std::set<std::string> storebagNames();
 
 // The code that identifies sessions of this type in reports. Null outside the range.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Counts what has left the device today, against the owner's limits. Any thread.
+// Counts the events and bytes that left the device today, for the owner's daily limits. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -16,26 +16,26 @@ class FileStore;
 
 namespace veltrad::config {
 
-// A day is one of UTC. Kept over a restart in {"day": days since 1970, "events": n, "bytes": n}; a file that
-// holds nothing of this kind counts as a new day. Counts while no limit holds, too, so that one which is set
-// at noon covers the morning.
+// Days are in UTC. The counts survive a restart in a file {"day": days since 1970, "events": n, "bytes": n};
+// an invalid file counts as a new day. Counts also without limits, so that a limit that is set at noon
+// includes the morning.
 class DailyAllowance {
  public:
-  // What the constructor takes outlives it.
+  // The constructor's arguments must outlive it.
   DailyAllowance(platform::FileStore& files, const platform::Clock& clock, std::string path)
       : _files(files), _clock(clock), _path(std::move(path)) {}
 
-  // Counts there from now on, and goes on from what stands there, which outlives it and the process. To be
-  // called before anything is counted and before another thread exists.
+  // Counts there from now on, and goes on from what stands there, which must outlive it and the process. To
+  // be called before anything is counted and before another thread exists.
   void countIn(platform::DayAccount& account);
-  // Reads what was counted before the start. A shortage passes: to be called again until it has been read.
+  // Reads the counts from before the start. After a shortage call it again, until it succeeds.
   void load();
-  // False, and nothing is counted, if this would go beyond a limit, or if there is one and the file has not
+  // False, and nothing is counted, if this would exceed a limit, or if there is a limit and the file has not
   // been read yet.
   bool take(const PolicyRules& rules, std::uint64_t events, std::uint64_t bytes);
-  // What was taken a moment ago is not used.
+  // Returns an amount that was taken and not used.
   void giveBack(std::uint64_t events, std::uint64_t bytes);
-  // What the file is to hold, and numbers that differ where that differs.
+  // The content for the file, and its version.
   std::string text() const;
   std::uint64_t version() const;
 

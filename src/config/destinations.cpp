@@ -44,7 +44,7 @@ void Destinations::count(http::Departure::Kind kind, std::string_view to, std::u
   using Kind = http::Departure::Kind;
   constexpr Column kColumnOf[] = {Column::events, datagrams, files, logData};
   static_assert(static_cast<int>(Kind::logData) == 3);
-  const std::string address = http::addressOf(to).substr(0, http::kMostOfAddress);
+  const std::string_view address = http::addressOf(to).substr(0, http::kMostOfAddress);
   const std::int64_t now = hour();
   const Lock held(_mutex);
   if (_hours.empty() || _hours.rbegin()->first != now) forgetOld();
@@ -79,7 +79,7 @@ void Destinations::load() {
   forgetOld();
 }
 
-// Leaves those to which most bytes left.
+// Keeps the destinations with the most bytes.
 void Destinations::joinSmallest(ByAddress& sums) {
   if (sums.size() <= kMostShown) return;
   std::vector<ByAddress::const_iterator> order;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What has left in the last day, by destination. Any thread.
+// Counts what left the device in the last day, by destination. Any thread.
 #pragma once
 
 #include <array>
@@ -19,25 +19,25 @@ class FileStore;
 
 namespace veltrad::config {
 
-// Counts by the hour, so that "the last day" is the hour that runs and the 23 before. Kept over a restart in
-// a file of its own.
+// Counts by the hour: "the last day" is the current hour and the 23 before it. The counts survive a restart
+// in a separate file.
 class Destinations {
  public:
-  // Beyond so many, all others are one, "other".
+  // Further destinations are counted together as "other".
   static constexpr std::size_t kMost = 256;
 
-  // What the constructor takes outlives it.
+  // The constructor's arguments must outlive it.
   Destinations(platform::FileStore& files, const platform::Clock& clock, std::string path)
       : _files(files), _clock(clock), _path(std::move(path)) {}
 
-  // Reads what was counted before the start. A shortage passes: to be called again until it has been read.
+  // Reads the counts from before the start. After a shortage call it again, until it succeeds.
   void load();
   // `to`: the URL, or "udp://IP:PORT"; what follows the port does not count.
   void count(http::Departure::Kind kind, std::string_view to, std::uint64_t events, std::uint64_t bytes);
   // [{"to": scheme, host and port, "events", "datagrams", "files", "logData", "bytes"}], by "to". Of very
   // many, those to which least left are one, "other", too.
   Array lastDay() const;
-  // What the file is to hold, and a number that grows when that changes.
+  // The content for the file, and a number that grows with each change of it.
   std::string text() const;
   std::uint64_t version() const;
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Adds up what is dropped while the owner of the device turns reporting off. Any thread.
+// Counts what is dropped while the owner of the device turns reporting off. Any thread.
 #pragma once
 
 #include <array>
@@ -17,14 +17,14 @@ namespace veltrad::config {
 
 class DropReceipt {
  public:
-  // From now on until end(), what is dropped is added up.
+  // Starts counting, until end().
   void begin();
-  // `client`: as in Departure. Costs one comparison between receipts.
+  // `client`: as in Departure. Costs one comparison while no receipt is open.
   void add(http::Departure::Kind kind, const std::shared_ptr<const Dictionary>& client, std::uint64_t count) {
     if (_open.load(std::memory_order_acquire)) addUp(kind, client, count);
   }
-  // {"events", "datagrams", "files", "byClient": [the client's keys and these three]}. Long names are cut,
-  // and of very many clients the last ones are one without a name.
+  // {"events", "datagrams", "files", "byClient": [the client's keys and these three]}. Long names are
+  // truncated, and beyond the bound all further clients are one entry without a name.
   Dictionary end();
 
  private:

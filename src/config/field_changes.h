@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Who hears which fields of a message were taken out, or had their values hidden.
+// A listener for the fields of a message that were removed or hashed.
 #pragma once
 
 #include <cstddef>

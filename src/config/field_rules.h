@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Takes fields out of messages, or hides their values, as the owner's policy asks. Any thread.
+// Removes or hashes fields of messages as the owner's policy requires. Any thread.
 #pragma once
 
 #include <optional>
@@ -13,8 +13,8 @@
 
 namespace veltrad::config {
 
-// Immutable. Fields are found at any depth of dictionaries and arrays by their names, letter case ignored; of
-// one that is to be removed and hashed nothing stays.
+// Immutable. Fields are found by name, ignoring letter case, at any depth of dictionaries and arrays. A field
+// that is to be removed and hashed is removed.
 class FieldRules {
  public:
   // `secret`: of this device; the key of the digests. Without one, fields that are to be hashed are removed.
@@ -29,14 +29,14 @@ class FieldRules {
   bool apply(Dictionary& message, FieldChanges& changes) const;
   void apply(Value& value, FieldChanges& changes) const;
   // The value that stands for one that is to be hashed: the HMAC-SHA-256 of a text, or of the JSON text of
-  // another scalar, as 64 hexadecimal digits. Nothing: data, dates, arrays and dictionaries are removed, and
-  // everything while there is no secret.
+  // another scalar, as 64 hexadecimal digits. Absent if the value must be removed: data, dates, arrays and
+  // dictionaries, and every value while there is no secret.
   std::optional<std::string> digest(const Value& value) const;
 
  private:
   enum class Rule { keep, remove, hash };
   Rule ruleOf(std::string_view name) const;
-  // Nothing: it holds no such field.
+  // Absent if it holds no such field.
   std::optional<Dictionary> edited(const Dictionary& dictionary, FieldChanges& changes) const;
   std::optional<Value> edited(const Value& value, FieldChanges& changes) const;
 

@@ -49,7 +49,7 @@ struct Key {
   KeyType type;
   Range range;
   Need need;
-  // What applies without the key.
+  // The default, as a text.
   const char* byDefault;
   const char* meaning;
   // The keys of the dictionary, or of each dictionary in the array.
@@ -58,7 +58,8 @@ struct Key {
   // read the key.
   void (*read)(const Key&, const Value&, void* parsed) = nullptr;
   const char* choices = nullptr;  // the texts of a choice, "|" between them
-  // What has a meaning, for tools; the daemon reads all of `range`. Unbounded: as `range`.
+  // The range of meaningful values, for tools; the daemon accepts all of `range`. If unbounded, the same as
+  // `range`.
   Range sensible = {};
 };
 

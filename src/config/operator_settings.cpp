@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The keys of settings.json, and which of its contents holds. Any thread.
+// The keys of settings.json, and the choice of the valid content. Any thread.
 #include "config/operator_settings.h"
 
 #include <fmt/format.h>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// etc/veltrad/settings.json: what an operator chooses for the fleet. Any thread; the file is reread when it
-// changed.
+// etc/veltrad/settings.json: the operator's settings for a fleet. Any thread; the file is read again after a
+// change.
 #pragma once
 
 #include <cstddef>
@@ -13,7 +13,7 @@
 
 namespace veltrad::config {
 
-// A key whose one value switches something on.
+// A setting with one allowed value, which enables it.
 struct Chosen {
   bool on = false;
   operator bool() const { return on; }
@@ -62,33 +62,33 @@ struct SpoolChoices {
 };
 void take(const Key& key, const Value& value, std::optional<SpoolChoices>& field);
 
-// Of "keys"; those beyond are not read.
+// The number of keys that are read from "keys"; further ones are ignored.
 inline constexpr std::size_t kMostFurtherKeys = 16;
 
-// How a back end comes by its sampling factor.
+// The source of a back end's sampling factor.
 enum class Sampling { drawn, stable };
 void take(const Key& key, const Value& value, Sampling& field);
 
-// What holds without the file stands here.
+// The initial values are the defaults without the file.
 struct OperatorChoices {
   Sampling sampling = Sampling::drawn;
   StorebagChoices storebags;
   TextList keys;  // files in Root::keysDirectory()
   FatesChoices fates;
   CompressionChoices compression;
-  // Nothing: posts that fail are not kept.
+  // Absent if failed posts are not kept.
   std::optional<SpoolChoices> spool;
   std::optional<double> jitter = 0;  // a share
 
   static const KeyTable kKeys;
 };
 
-// A file that is broken, unreadable or holds a value of a wrong type or out of its range is one error line a
-// change, and the last good content stands. A key that is unknown, and further ones of "keys", are one
-// warning a change.
+// A file that is broken, unreadable or holds a value of a wrong type or out of its range is logged as one
+// error for each change, and the last good content stays in use. Unknown keys, and further elements of
+// "keys", are one warning for each change.
 class OperatorSettings final : public SettingsFollower<OperatorChoices> {
  public:
-  // `path`: of either form. What holds is null while the file has never been good, or could not be read yet.
+  // `path`: of either form. current() is null until the file was good once.
   OperatorSettings(platform::FileStore& files, const std::string& path);
 };
 

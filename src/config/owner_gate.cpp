@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts the owner's word together. Any thread.
+// Computes the owner's decision. Any thread.
 #include "config/owner_gate.h"
 
 #include <algorithm>
@@ -15,7 +15,7 @@
 namespace veltrad::config {
 
 namespace {
-// Nothing: it cannot be read just now.
+// Absent if it cannot be read at the moment.
 std::optional<bool> isTrue(platform::Preferences& preferences, const char* key) {
   const auto found = preferences.lookUp(platform::kVeltraPreferenceDomain, key);
   if (!found) return std::nullopt;
@@ -35,8 +35,8 @@ std::optional<support::HistorySpace> spaceOf(const std::optional<HistoryBounds>&
 }
 }  // namespace
 
-std::optional<wire::Reason> OwnersWord::refusalFor(std::string_view backend,
-                                                   const std::vector<std::string>& hosts) const {
+std::optional<wire::Reason> OwnerDecision::refusalFor(std::string_view backend,
+                                                      const std::vector<std::string>& hosts) const {
   if (refusal) return refusal;
   if (!policy->makes(backend)) return wire::Reason::policy_backends;
   const bool reaches = hosts.empty() || std::any_of(hosts.begin(), hosts.end(), [this](const auto& host) {
@@ -62,7 +62,7 @@ bool OwnerGate::refresh() {
       rules.consent == ConsentRule::always ? isTrue(_preferences, preference::kConsent) : true;
   if (!off || !consent) return false;
   const auto refusal = *off ? wire::Reason::privacy_off : policy->refusal(*consent);
-  const auto before = word();
+  const auto before = decision();
   // While it cannot be read, fields that are to be hashed are removed, so that the rest of the policy holds.
   const auto secret = rules.hash.texts.empty() ? std::nullopt : _secret.bytes();
   auto fields = before->fields;
@@ -75,21 +75,21 @@ bool OwnerGate::refresh() {
       resets == before->resets)
     return false;
   if (_history && policy != before->policy) _history->keep(spaceOf(rules.history));
-  auto word =
-      std::make_shared<const OwnersWord>(OwnersWord{std::move(policy), refusal, std::move(fields), resets});
+  auto decision = std::make_shared<const OwnerDecision>(
+      OwnerDecision{std::move(policy), refusal, std::move(fields), resets});
   const Lock held(_mutex);
-  _word = std::move(word);
+  _decision = std::move(decision);
   _turn.fetch_add(1, std::memory_order_release);
   return true;
 }
 
-std::shared_ptr<const OwnersWord> OwnerGate::word() const {
+std::shared_ptr<const OwnerDecision> OwnerGate::decision() const {
   const Lock held(_mutex);
-  return _word;
+  return _decision;
 }
 
 std::optional<http::RequestRefusal> OwnerGate::refusal(bool forStorebag, std::string_view host) const {
-  const auto now = word();
+  const auto now = decision();
   auto reason = forStorebag ? std::nullopt : now->refusal;
   if (!reason && !now->policy->reaches(host)) reason = wire::Reason::policy_hosts;
   if (!reason) return std::nullopt;
@@ -105,7 +105,7 @@ std::optional<http::RequestRefusal> OwnerGate::count(const http::Departure& depa
 }
 
 bool OwnerGate::mayLeave(std::uint64_t events, std::uint64_t bytes) {
-  return _allowance.take(word()->policy->rules(), events, bytes);
+  return _allowance.take(decision()->policy->rules(), events, bytes);
 }
 
 void OwnerGate::datagramLeft(std::string_view to, std::uint64_t events, std::uint64_t bytes) {

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The owner's word on what may leave the device: policy, consent and "reporting off" together. Any thread.
+// Decides what may leave the device, from the owner's policy, consent and "reporting off". Any thread.
 #pragma once
 
 #include <atomic>
@@ -30,8 +30,8 @@ class History;
 
 namespace veltrad::config {
 
-// Immutable.
-struct OwnersWord {
+// The owner's decision at one time. Immutable.
+struct OwnerDecision {
   std::shared_ptr<const Policy> policy = Policy::closed();
   // Why no back end reports; nothing: each may.
   std::optional<wire::Reason> refusal = wire::Reason::policy_broken;
@@ -40,35 +40,35 @@ struct OwnersWord {
   // How often the owner has reset the identifiers since the start.
   std::uint64_t resets = 0;
 
-  // Why a back end may not report; nothing: it may. `hosts`: those that it may send to; one that the policy
-  // lists suffices, because each request is asked for again.
+  // Why a back end may not report; nothing: it may. `hosts`: those that it may send to. One host that the
+  // policy allows is enough, because each request is checked again.
   std::optional<wire::Reason> refusalFor(std::string_view backend,
                                          const std::vector<std::string>& hosts) const;
 };
 
-// What cannot be read for a shortage is no change.
+// A file that cannot be read because of a shortage counts as unchanged.
 class OwnerGate final : public http::RequestGate {
  public:
-  // The arguments outlive it; without destinations and a history, nobody keeps account. Nothing may leave
-  // before the first refresh().
+  // The arguments must outlive it; destinations and history may be null, then nothing is counted or recorded
+  // there. Nothing may leave before the first refresh().
   OwnerGate(OwnerPolicy& policy, platform::Preferences& preferences, platform::DeviceSecret& secret,
             DailyAllowance& allowance, Destinations* destinations = nullptr,
             support::History* history = nullptr);
 
-  // Reads again what has changed. True if the word is another one. One thread at a time.
+  // Reads changed files again. True if the decision has changed. One thread at a time.
   bool refresh();
-  // The identifiers and the secret are others now; the next refresh() says so.
+  // To be called after identifiers and secret were replaced; the next refresh() publishes this.
   void identifiersReset() { _resets.fetch_add(1, std::memory_order_relaxed); }
-  // The word of the last refresh, never null.
-  std::shared_ptr<const OwnersWord> word() const;
-  // Grows with each change of the word, so that its readers see cheaply that there is one.
+  // The decision of the last refresh, never null.
+  std::shared_ptr<const OwnerDecision> decision() const;
+  // Grows with each change of the decision, so that readers detect a change cheaply.
   std::uint64_t turn() const { return _turn.load(std::memory_order_acquire); }
-  // A request for a storebag is asked for its host alone.
+  // For a storebag request only the host is checked.
   std::optional<http::RequestRefusal> refusal(bool forStorebag, std::string_view host) const override;
   std::optional<http::RequestRefusal> count(const http::Departure& departure) override;
-  // Counts for the limits of a day alone: a datagram, or the bytes of a transmission.
+  // Counts a datagram, or the bytes of a transmission, for the daily limits only.
   bool mayLeave(std::uint64_t events, std::uint64_t bytes);
-  // What was counted so has not left.
+  // Takes such a count back, because nothing has left.
   void didNotLeave(std::uint64_t events, std::uint64_t bytes) { _allowance.giveBack(events, bytes); }
   // A datagram has been sent; `events`: 0 for its further transmissions.
   void datagramLeft(std::string_view to, std::uint64_t events, std::uint64_t bytes);
@@ -80,7 +80,7 @@ class OwnerGate final : public http::RequestGate {
   void refused(const http::Departure& departure) override {
     _receipt.add(departure.kind, departure.client, departure.events);
   }
-  // Whoever drops something for the owner's sake adds it.
+  // Everything that is dropped because of the owner's decision is added here.
   DropReceipt& receipt() { return _receipt; }
 
  private:
@@ -94,7 +94,7 @@ class OwnerGate final : public http::RequestGate {
   std::atomic<std::uint64_t> _resets{0};
   DropReceipt _receipt;
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
-  std::shared_ptr<const OwnersWord> _word GUARDED_BY(_mutex) = std::make_shared<const OwnersWord>();
+  std::shared_ptr<const OwnerDecision> _decision GUARDED_BY(_mutex) = std::make_shared<const OwnerDecision>();
 };
 
 }  // namespace veltrad::config

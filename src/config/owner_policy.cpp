@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which content of policy.json holds. Any thread.
+// Chooses the valid content of policy.json. Any thread.
 #include "config/owner_policy.h"
 
 namespace veltrad::config {

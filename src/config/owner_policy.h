@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads etc/veltrad/policy.json again when it changed. Any thread.
+// etc/veltrad/policy.json, read again after each change. Any thread.
 #pragma once
 
 #include <string>
@@ -9,8 +9,8 @@
 
 namespace veltrad::config {
 
-// A file that is broken or cannot be read closes everything, with one error line a change. Everything is
-// closed before the first reading, too. What holds is never null.
+// With a broken or unreadable file nothing may leave, and one error is logged for each change. The same
+// applies before the first reading. current() is never null.
 class OwnerPolicy final : public SettingsFollower<Policy> {
  public:
   // `path`: of either form.

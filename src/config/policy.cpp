@@ -15,7 +15,7 @@ namespace {
 using enum KeyType;
 using enum Need;
 
-// What a double counts exactly.
+// The largest count that a double represents exactly.
 constexpr double kMostCount = 9'007'199'254'740'992;
 constexpr Range kCount{0, kMostCount};
 constexpr Range kHistoryBytes{65'536, kMostCount};

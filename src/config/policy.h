@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the owner of the device lets leave it, as etc/veltrad/policy.json says. Values to verdicts; any
-// thread.
+// The owner's policy from etc/veltrad/policy.json, and its verdicts on what may leave the device. Pure
+// functions; any thread.
 #pragma once
 
 #include <cstdint>
@@ -35,7 +35,7 @@ struct HistoryBounds {
 };
 void take(const Key& key, const Value& value, std::optional<HistoryBounds>& field);
 
-// What holds without the file stands here.
+// The initial values are the defaults without the file.
 struct PolicyRules {
   Reporting reporting = Reporting::on;
   ConsentRule consent = ConsentRule::storebag;
@@ -51,21 +51,21 @@ struct PolicyRules {
   static const KeyTable kKeys;
 };
 
-// Immutable. Each verdict can only narrow what a storebag lets out.
+// Immutable. A verdict can only restrict what a storebag allows.
 class Policy {
  public:
   // Without limits.
   Policy() = default;
   explicit Policy(PolicyRules rules) : _rules(std::move(rules)) {}
-  // Nothing leaves: the file is broken, or could not be read yet.
+  // A policy with which nothing leaves, for a file that is broken or could not be read yet.
   static std::shared_ptr<const Policy> closed();
-  // Nothing: the file is broken, and `error` says where: "PATH:LINE:COLUMN: text". An unknown key or a value
-  // of a wrong type breaks it; a back end of an unknown name does not. `content` is good.
+  // Absent if the file is broken; `error` then says where: "PATH:LINE:COLUMN: text". An unknown key or a
+  // value of a wrong type breaks it; a back end of an unknown name does not. `content` is good.
   static std::shared_ptr<const Policy> of(const platform::LocalContent& content, std::string& error);
 
   const PolicyRules& rules() const { return _rules; }
   bool broken() const { return _broken; }
-  // What the file says; nothing without one that is good.
+  // The content of the file; absent without a good file.
   const std::optional<Dictionary>& asGiven() const { return _asGiven; }
   // Why no back end reports: policy_broken, policy_reporting, policy_consent; nothing: each may.
   std::optional<wire::Reason> refusal(bool consent) const;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// By the table of preferences, through their files.
+// Uses the table of preferences and the preference files.
 #include "config/preference_editor.h"
 
 #include "base/null_value.h"

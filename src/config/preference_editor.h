@@ -16,8 +16,8 @@ class FilePreferences;
 
 namespace veltrad::config {
 
-// Answers as the control socket carries them, or one line that says what is wrong. What the constructor takes
-// outlives it.
+// Answers as the control socket carries them, or one line that says what is wrong. The constructor's
+// arguments must outlive it.
 class PreferenceEditor {
  public:
   using Answer = Result<Dictionary, std::string>;
@@ -25,8 +25,7 @@ class PreferenceEditor {
   PreferenceEditor(platform::FilePreferences& preferences, platform::DeviceProperties& device)
       : _preferences(preferences), _device(device) {}
 
-  // {"keys": [{"name", "domain", "type", "value", "default", "effect"}]}. A value that is not set, and a
-  // default that there is not, are not a number.
+  // {"keys": [{"name", "domain", "type", "value", "default", "effect"}]}. A missing value or default is NaN.
   Answer list();
   // {"name", "value": the text that a person wrote}. Answers {}.
   Answer set(const Dictionary& arguments);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The table, and values by it.
+// The table of preferences, and the conversion of their values.
 #include "config/preference_keys.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The preferences that the system reads: one table for those who read, change and describe them. Constants
+// One table of the preferences that the system reads, for reading, changing and describing them. Constants
 // and pure functions; any thread.
 #pragma once
 
@@ -13,7 +13,7 @@
 
 namespace veltrad::config {
 
-// Names in the domain platform::kVeltraPreferenceDomain. The identifiers' own stand in support/veltra.h.
+// Names in the domain platform::kVeltraPreferenceDomain. Those of the identifiers are in support/veltra.h.
 namespace preference {
 inline constexpr const char* kConsent = "DiagnosticLogSubmissionEnabled";
 inline constexpr const char* kEnvironmentType = "environmentType";
@@ -27,14 +27,14 @@ inline constexpr const char* kTimeDomain = "com.florn.timed";
 inline constexpr const char* kAutomaticTimeZone = "TMAutomaticTimeZoneEnabled";
 }  // namespace preference
 
-// Of ProcessSettings::currentEnvironment().
+// The number of values of ProcessSettings::currentEnvironment().
 inline constexpr std::uint32_t kEnvironmentCount = 5;
 inline constexpr std::uint32_t kInternalEnvironment = 2;
 inline constexpr std::uint32_t kSeedEnvironment = 3;
 
 struct PreferenceKey {
   enum class Type { boolean, integer, text };
-  // When a change is seen: by the sessions that start from then on, or at the next start of the daemon.
+  // When a change takes effect: for new sessions, or at the next start of the daemon.
   enum class Effect { now, nextStart };
 
   std::string_view domain;

@@ -21,12 +21,12 @@ class DeviceIdentity;
 
 namespace veltrad::config {
 
-// Whether the address is that of a host which stands in for one that nobody has named.
+// Whether the host of the address is the built-in placeholder.
 bool isExampleStorebagURL(std::string_view url);
 
 // Each setting is computed at its first call and kept: a preference that changes later takes effect at the
-// next start. During a shortage a setting is absent, and a later call computes it. What the constructor takes
-// must outlive it.
+// next start. During a shortage a setting is absent, and a later call computes it. The constructor's
+// arguments must outlive it.
 class ProcessSettings {
  public:
   // `deploymentPath`: of either form; the file holds the texts "internalStorebagHost" and
@@ -40,7 +40,7 @@ class ProcessSettings {
   std::optional<std::string> storebagServerURL();
   // Reads the deployment file again, if the address comes from there; for a broken file it stays as it is.
   void readDeploymentAgain();
-  // What is wrong with the deployment file, as it was when the address was computed; empty: nothing is known.
+  // The problem of the deployment file when the address was computed; empty if there is none.
   std::string deploymentProblem();
 
  private:

@@ -17,21 +17,20 @@ namespace veltrad::config {
 std::optional<SeenStorebags> seenStorebagsIn(std::string_view json);
 std::string textOf(const SeenStorebags& seen);
 
-// A file that is not there has seen nothing. One that is torn is left as it is and vouches for nothing: to
-// take it for an empty one would let through what it was to keep out, so that nothing is accepted until
-// somebody removes it.
+// A missing file counts as empty. A damaged file is not changed, and no storebag is accepted until somebody
+// removes it, because an empty record would admit storebags that were refused before.
 class SeenStorebagsFile {
  public:
-  // The store outlives it.
+  // The store must outlive it.
   SeenStorebagsFile(platform::FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
 
-  // Why there is nothing to be had: a shortage, or a torn file, in one line that names it.
+  // Why the record is not available: a shortage, or a damaged file; one line that names the file.
   struct Failed {
     bool passes;
     std::string description;
   };
   Result<SeenStorebags, Failed> seen();
-  // Takes an accepted bag in, on disk before it returns. What cannot be written is one warning, and is
+  // Records an accepted bag, on disk before it returns. A failure to write is one warning; the data is
   // written with the next accepted bag.
   void remember(const std::string& name, const StorebagClaims& claims, const StorebagSigners& signers,
                 const StorebagRules& rules);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What is wrong with the keys of a settings file, and where. A plain function; any thread.
+// Finds wrong keys and values in a settings file, with their places. A pure function; any thread.
 #include "config/settings_check.h"
 
 #include <fmt/format.h>
@@ -37,7 +37,7 @@ std::string rangeText(const Range& range) {
   return range.least < range.most ? fmt::format(" from {} to {}", range.least, range.most) : "";
 }
 
-// What was expected; nothing: the value fits.
+// The expected value as a text; absent if the value fits.
 std::optional<std::string> expectedInstead(const Key& key, const Value& value) {
   const bool isInteger =
       value.type() == Value::Type::signedInteger || value.type() == Value::Type::unsignedInteger;

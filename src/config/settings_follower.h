@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a settings file says, read again when the file has changed. Any thread.
+// The meaning of a settings file, read again after each change of the file. Any thread.
 #pragma once
 
 #include <memory>
@@ -24,20 +24,20 @@ struct SettingsLines {
   }
 };
 
-// A shortage is no change: what held goes on.
+// During a shortage the last content stays in use.
 template <typename T>
 class SettingsFollower {
  public:
-  // What a content means, which is decided once for each. `before`: what held until then.
+  // Interprets a new content, once for each content. `before`: the previous meaning.
   using Meaning = std::shared_ptr<const T> (*)(const platform::LocalContent& content,
                                                const std::shared_ptr<const T>& before, SettingsLines& lines);
 
-  // `path`: of either form. `first` holds until the file could be read. The store outlives it.
+  // `path`: of either form. `first` holds until the file could be read. The store must outlive it.
   SettingsFollower(platform::FileStore& files, const std::string& path, Meaning meaning,
                    std::shared_ptr<const T> first)
       : _meaning(meaning), _file(files, path), _now(std::move(first)) {}
 
-  // What holds now; one object until that changes.
+  // The current meaning; the same object until it changes.
   std::shared_ptr<const T> current() {
     SettingsLines lines;
     std::shared_ptr<const T> now;
@@ -45,7 +45,7 @@ class SettingsFollower {
       const Lock held(_mutex);
       auto content = _file.content();
       if (content && content.value() != _content) {
-        // Taken over together, or, for want of memory, at the next call.
+        // Taken over together, or, for lack of memory, at the next call.
         _now = _meaning(*content.value(), _now, lines);
         _content = std::move(content).value();
       }

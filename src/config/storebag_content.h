@@ -57,7 +57,7 @@ struct UploadProfile {
 
 using Profile = std::variant<HTTPSPostProfile, DashboardProfile, UploadProfile>;
 
-// Where a section is from, as those who look after the device know it.
+// The origin of a section, for administrators.
 struct StorebagOrigin {
   std::string name;                    // of the storebag
   std::optional<std::string> version;  // which it need not have

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Downloads storebags and has their containers judged. Blocks the caller's thread.
+// Downloads storebags and has StorebagTrust check them. Blocks the caller's thread.
 #pragma once
 
 #include <cstdint>
@@ -37,8 +37,8 @@ struct WholeStorebagAnswer : StorebagAnswer {
   std::string container;  // its signed bytes; empty for a default storebag
 };
 
-// Keeps no state between calls, so any number of threads may call it. What the constructor takes must outlive
-// it.
+// Keeps no state between calls, so any number of threads may call it. The constructor's arguments must
+// outlive it.
 class StorebagDownload {
  public:
   StorebagDownload(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra,

@@ -19,7 +19,7 @@ class StorebagKey {
 
   static constexpr int kFewestModulusBits = 2'048;
   static constexpr int kMostModulusBits = 8'192;
-  // Of a fingerprint: enough to name a key.
+  // The length of a shortened fingerprint, enough to name a key.
   static constexpr std::size_t kShortFingerprint = 16;
 
   // From DER with nothing after it: SubjectPublicKeyInfo (RFC 5280) with the plain RSA algorithm, or

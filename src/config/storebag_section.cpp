@@ -37,6 +37,27 @@ Storebag takeSection(const char* name, const Dictionary& whole, std::uint32_t en
   return storebag;
 }
 
+StorebagSectionAnswer withoutName(std::int32_t clientType) {
+  logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
+           clientType);
+  StorebagSectionAnswer none;
+  none.cause = StorebagCause::noName;
+  none.why = "client type " + std::to_string(clientType) + " has no storebag";
+  return none;
+}
+
+// The storebag has no section for the environment.
+void sayMissing(std::int32_t clientType, std::uint32_t environment, StorebagSectionAnswer& answer) {
+  const char* sectionName = sectionNameForEnvironment(environment);
+  logError(
+      "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
+      "environment",
+      clientType, sectionName != nullptr ? sectionName : "(null)");
+  if (answer.cause != StorebagCause::none) return;
+  answer.cause = StorebagCause::noSection;
+  answer.why = sectionName ? "it has no section \"" + std::string(sectionName) + "\""
+                           : "environment " + std::to_string(environment) + " names no section";
+}
 }  // namespace
 
 const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment) {
@@ -66,14 +87,7 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     std::int32_t clientType, const std::optional<std::string>& lastModified) {
   using Kind = StorebagAnswer::Kind;
   const char* name = storebagNameForClientType(clientType);
-  if (name == nullptr) {
-    logError("fetchStorebagForEnvironmentAndClientType: Could not find storebag name for client type %d",
-             clientType);
-    StorebagSectionAnswer none;
-    none.cause = StorebagCause::noName;
-    none.why = "client type " + std::to_string(clientType) + " has no storebag";
-    return none;
-  }
+  if (name == nullptr) return withoutName(clientType);
   const auto choices = _choices.current();
   if (!choices) {
     refuse(clientType);
@@ -82,12 +96,13 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
     return none;
   }
   const bool persist = choices->storebags.persist;
-  // What is to be kept must come whole once.
+  // A storebag that is to be kept must be downloaded completely once.
   const bool conditional = !persist || _store.holds(name);
   WholeStorebagAnswer whole =
       _download.fetchStorebagWithName(name, conditional ? lastModified : std::nullopt, *choices);
   StorebagSectionAnswer answer{whole, nullptr, {}};
-  // What was refused is not held, and may be right once its key or the clock is: it is to come whole again.
+  // A refused storebag is not stored, and may be accepted later, with another key or clock: the next request
+  // is unconditional.
   if (answer.kind == Kind::failed && StorebagRules::of(*choices).any()) answer.lastModified = lastModified;
   if (answer.kind == Kind::failed && answer.attempted)
     logError("fetchStorebagForEnvironmentAndClientType: Could not fetch storebag for client type %d",
@@ -104,16 +119,7 @@ StorebagSectionAnswer StorebagSections::fetchStorebagForEnvironmentAndClientType
   }
   const Storebag storebag = takeSection(name, whole.storebag, *environment, answer);
   if (answer.kind != Kind::fetched) {
-    const char* sectionName = sectionNameForEnvironment(*environment);
-    logError(
-        "fetchStorebagForEnvironmentAndClientType: Could not find storebag for client type %d with %s "
-        "environment",
-        clientType, sectionName != nullptr ? sectionName : "(null)");
-    if (answer.cause == StorebagCause::none) {
-      answer.cause = StorebagCause::noSection;
-      answer.why = sectionName ? "it has no section \"" + std::string(sectionName) + "\""
-                               : "environment " + std::to_string(*environment) + " names no section";
-    }
+    sayMissing(clientType, *environment, answer);
     return answer;
   }
   if (storebag.refreshCycle) {
@@ -164,7 +170,7 @@ double StorebagSections::jitter() {
   return choices ? *choices->jitter : 0;
 }
 
-// Clients can cause it at will.
+// Clients can trigger this line, so it is limited.
 void StorebagSections::refuse(std::int32_t clientType) {
   _counters.count(wire::Reason::settings_broken);
   const auto line = _refusals.happened(

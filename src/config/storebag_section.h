@@ -21,9 +21,9 @@ struct Storebag;
 // that of "release".
 const Dictionary* sectionOf(const Storebag& storebag, std::uint32_t environment);
 
-// The real source: downloads the storebag at each call, and keeps it on disk where the operator has chosen
-// so. While the operator's choices cannot be read and never could, there is no attempt. Any number of threads
-// at once, one for each storebag. What the constructor takes must outlive it.
+// The real source: downloads the storebag at each call, and keeps it on disk if the operator has chosen so.
+// Makes no attempt until the operator's settings could be read once. Any number of threads at once, one for
+// each storebag. The constructor's arguments must outlive it.
 class StorebagSections final : public StorebagSource {
  public:
   StorebagSections(http::HTTPClient& http, ProcessSettings& settings, const support::Veltra& veltra,

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The interface from which the agent gets storebag sections, and its answers.
+// The interface that provides storebag sections to the agent.
 #pragma once
 
 #include <cstdint>
@@ -13,7 +13,7 @@ namespace veltrad::config {
 
 struct StorebagSection;
 
-// Why the server's word is not what a session gets, the default storebag included.
+// Why a session does not get the server's storebag; also set with the default storebag.
 enum class StorebagCause {
   none,        // it is; or the copy is current
   noAttempt,   // short of something just now, or stopping
@@ -51,11 +51,11 @@ struct StorebagAnswer {
 struct StorebagSectionAnswer : StorebagAnswer {
   // Null unless it was fetched.
   std::shared_ptr<const StorebagSection> section;
-  // Of its storebag, which need not have one.
+  // The version of its storebag, if it has one.
   std::optional<std::string> version;
 };
 
-// What an earlier daemon has kept of a storebag.
+// The section of a storebag that an earlier daemon has kept.
 struct KeptSection {
   bool known = false;  // false: not asked to keep any, or nobody can say just now
   StorebagSectionAnswer answer;
@@ -70,10 +70,11 @@ class StorebagSource {
   // the caller's copy. May block for a request to the server.
   virtual StorebagSectionAnswer fetchStorebagForEnvironmentAndClientType(
       std::int32_t clientType, const std::optional<std::string>& lastModified) = 0;
-  // What is kept of the client type's storebag, verified again; it has a section, or nothing is there to use.
+  // The kept section of the client type's storebag, verified again; without a section if there is nothing
+  // usable.
   virtual KeptSection keptStorebag(std::int32_t) { return {}; }
-  // Why a section that was fetched before is not to be used any more: "expired on …". Nothing: it is. Takes
-  // leaf locks only.
+  // Why a section that was fetched before may no longer be used: "expired on …"; absent if it may. Takes leaf
+  // locks only.
   virtual std::optional<std::string> whyNotUsed(const StorebagSection&) { return std::nullopt; }
   // The share, from 0 to 1, by which the waits between fetches are spread. Takes leaf locks only.
   virtual double jitter() { return 0; }

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Storebags that survive a restart: a file a name, as they were downloaded. Any thread.
+// Keeps downloaded storebags over a restart, one file for each name. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -22,20 +22,21 @@ struct KeptStorebag {
   double fetchTime = 0;                     // seconds since 1970
 };
 
-// DIRECTORY/NAME (mode 0600, the directory 0700 and made when needed) is a property list of
-// {"container", "lastModified", "maxAge", "fetchTime"}. Nothing in it is vouched for but by the container's
-// own signature. One thread at a time for a name. What the constructor takes outlives it.
+// DIRECTORY/NAME (mode 0600, the directory 0700 and made when needed) is a property list of {"container",
+// "lastModified", "maxAge", "fetchTime"}. The file is not trusted: the container's signature is verified
+// again. One thread at a time for each name. The constructor's arguments must outlive it.
 class StorebagStore {
  public:
   StorebagStore(platform::FileStore& files, const platform::Clock& clock, std::string directory)
       : _files(files), _clock(clock), _directory(std::move(directory)) {}
 
   bool holds(const std::string& name);
-  // Nothing: none is there, or it was broken and is removed, which one warning says. A failure is a shortage.
+  // Absent if there is none, or if it was broken; then it is removed with one warning. A failure is a
+  // shortage.
   Result<std::optional<KeptStorebag>, platform::FileFailure> read(const std::string& name);
-  // As fetched now. What cannot be written is one warning, and the older file stays.
+  // Stores a storebag that was fetched now. On failure one warning is logged, and the older file stays.
   void write(const std::string& name, KeptStorebag storebag);
-  // The server says that what is there is current.
+  // Renews the stored storebag, because the server says that it is current.
   void renew(const std::string& name, std::int32_t maxAge);
   void remove(const std::string& name, const std::string& why);
 

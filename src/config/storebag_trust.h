@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether the bytes of a container are a storebag that this device may use. Any thread.
+// Verifies whether the bytes of a container are a storebag that this device may use. Any thread.
 #pragma once
 
 #include <optional>
@@ -33,8 +33,8 @@ class SeenStorebagsFile;
 std::vector<std::string> ed25519SignersOf(const StorebagContainer& container, const std::string& bag,
                                           const std::vector<StorebagKey>& keys);
 
-// Verifies with the keys of today: publicKey.der, and those that the operator has chosen. Then applies the
-// operator's rules, and remembers what it has accepted. What the constructor takes outlives it.
+// Verifies with the current keys: publicKey.der, and those that the operator has chosen. Then applies the
+// operator's rules, and records accepted storebags. The constructor's arguments must outlive it.
 class StorebagTrust {
  public:
   StorebagTrust(const support::Veltra& veltra, platform::FileStore& files, SeenStorebagsFile& seen,

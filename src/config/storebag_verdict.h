@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether a storebag whose signature is good may be used. Plain functions; any thread.
+// Decides whether a storebag with a good signature may be used. Pure functions; any thread.
 #pragma once
 
 #include <cstdint>
@@ -26,7 +26,7 @@ struct StorebagRules {
 
   static StorebagRules of(const OperatorChoices& choices);
   bool any() const { return revocation || ed25519 || names || expiry || rollback; }
-  // They ask for what is remembered.
+  // True if a rule needs the record of seen storebags.
   bool remember() const { return revocation || rollback; }
 };
 
@@ -36,9 +36,10 @@ struct StorebagSigners {
   std::vector<std::string> ed25519;
 };
 
-// What has been seen of storebags that were accepted.
+// The record of accepted storebags.
 struct SeenStorebags {
-  // The highest serial by storebag and by signer, so that what a key has set goes when it is revoked.
+  // The highest serial by storebag and by signer, so that revoking a key also removes the serials that it has
+  // set.
   std::map<std::string, std::map<std::string, std::int64_t>> serials;
   std::set<std::string> revoked;  // fingerprints
 
@@ -47,16 +48,16 @@ struct SeenStorebags {
   std::optional<std::int64_t> highest(const std::string& name, const std::set<std::string>& without) const;
 };
 
-// What a bag says of itself.
+// The claims of a bag: serial, date, name and revocations.
 struct StorebagClaims {
   std::optional<std::string> name;
   std::optional<std::int64_t> serial;
   std::optional<std::string> expires;  // as given
   std::vector<std::string> revoked;    // fingerprints
-  // By key what is said in a form that cannot be read: "its "expires" is no date".
+  // Claims that cannot be read, by key: "its "expires" is no date".
   std::map<std::string, std::string> unreadable;
 
-  // Of a verified storebag. Digits of fingerprints may be capitals; here they are small.
+  // Reads the claims of a verified storebag. Fingerprints are converted to lower case.
   static StorebagClaims of(const Dictionary& storebag);
 };
 
@@ -65,20 +66,20 @@ struct StorebagRefusal {
   std::string text;  // "serial 4 is lower than 5"
 };
 
-// Decided before the bag is parsed: whether a key that may still sign vouches for it.
+// Decided before the bag is parsed: whether a key that is not revoked has signed it.
 std::optional<StorebagRefusal> refusalOfSigners(const StorebagSigners& signers, const SeenStorebags& seen,
                                                 const StorebagRules& rules);
 
-// Decided on what the bag says. Its own revocations hold for it, too. `now`: seconds since 1970; a clock
-// before this release is none, and nothing expires by it.
+// Decided by the claims of the bag. Its own revocations apply to it, too. `now`: seconds since 1970; if the
+// clock shows a time before this release, nothing expires.
 std::optional<StorebagRefusal> refusalOfClaims(const std::string& name, const StorebagClaims& claims,
                                                const StorebagSigners& signers, const SeenStorebags& seen,
                                                const StorebagRules& rules, double now);
 
-// Why a bag with this "expires" may not be used now; nothing: it may.
+// Why a bag with this "expires" may not be used now; absent if it may.
 std::optional<StorebagRefusal> refusalOfExpiry(const std::optional<std::string>& expires, double now);
 
-// Takes an accepted bag into what was seen.
+// Adds an accepted bag to the record.
 void remember(SeenStorebags& seen, const std::string& name, const StorebagClaims& claims,
               const StorebagSigners& signers, const StorebagRules& rules);
 

@@ -76,7 +76,7 @@ std::string Daemon::runSpool() {
   return made ? std::string() : made.error();
 }
 
-// What the settings say is not known while they cannot be read.
+// The settings are unknown while they cannot be read.
 std::string Daemon::removeSpool() {
   const auto choices = _choices.current();
   if (!choices || choices->spool) return {};

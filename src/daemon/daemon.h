@@ -27,8 +27,8 @@
 
 namespace veltrad::daemon {
 
-// The objects between the services and the listener. The services outlive it; it outlives the listener. Its
-// 21 fields are these objects, in the order in which they need each other, whatever the padding.
+// The objects between the services and the listener. The services must outlive it; it outlives the listener.
+// Its 21 fields are these objects, in the order in which they need each other, whatever the padding.
 // NOLINTNEXTLINE(clang-analyzer-optin.performance.Padding)
 class Daemon {
  public:
@@ -42,10 +42,10 @@ class Daemon {
   config::ProcessSettings& settings() { return _settings; }
   config::StorebagSource& storebags() { return _storebags; }
   platform::FateRing& fates() { return _fates; }
-  // Null: posts that fail are lost.
+  // Null if there is no spool: failed posts are lost.
   backends::PostSpool* spool() { return _spool ? &*_spool : nullptr; }
-  // Sends what an earlier daemon has kept, and what this one keeps, or removes it where the operator wants no
-  // spool any more. Called again each second, because it may find the daemon short of something.
+  // Sends the posts that this daemon or an earlier one has kept, or removes them if the operator has switched
+  // the spool off. Called again each second, because a shortage may prevent it.
   void startSpool();
   // From now on nothing of the spool is sent.
   void stopSpool();

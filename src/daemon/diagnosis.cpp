@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Each check by itself; those about the server know what was found on the way to it.
+// The checks, each in a function; those about the server use the results of the checks before.
 #include "daemon/diagnosis.h"
 
 #include <fmt/format.h>
@@ -110,7 +110,7 @@ bool anyAnswered(const Findings& findings) {
                      [](const StorebagFinding& finding) { return finding.answer.status != 0; });
 }
 
-// An error's page is no storebag either, but that says nothing of it.
+// An error page is no storebag either, but this does not mean that the storebag is wrong.
 std::string labelled(const StorebagFinding& finding) {
   const bool refused = finding.answer.cause == Cause::noStorebag && finding.answer.status >= 400;
   return fmt::format(
@@ -188,7 +188,7 @@ Check checkStorebag(const StorebagFacts& facts, const std::string& address) {
   if (problems.empty()) return ok(kName, fmt::format("{} fetched", findings.size()));
   const std::string mend =
       fmt::format("publish the storebag, made with `veltra-storebag sign`, under {}/NAME", address);
-  // Nobody has asked for these so far, and a fleet need not have all.
+  // No session has asked for these so far, and a fleet need not have all of them.
   const bool spare =
       !facts.needed && std::all_of(findings.begin(), findings.end(), [](const StorebagFinding& one) {
         return !isNoStorebag(one) || one.answer.status == 404;

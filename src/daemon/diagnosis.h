@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The checks of `veltractl doctor`: from facts to verdicts, each with the one thing to do. Pure functions;
-// any thread.
+// The checks of `veltractl doctor`: each maps facts to a result with one advice. Pure functions; any thread.
 #pragma once
 
 #include <cstdint>
@@ -15,7 +14,7 @@
 namespace veltrad::daemon {
 
 struct Check {
-  // skipped: another check's failure leaves nothing to look at.
+  // skipped: the check is impossible because another check failed.
   enum class Result { ok, warning, failure, skipped };
   const char* name;  // of wire::check::kNames
   Result result;
@@ -40,7 +39,7 @@ struct AddressFacts {
   std::string deploymentProblem;
 };
 
-// What one request for a storebag has shown.
+// The result of one request for a storebag.
 struct StorebagFinding {
   std::string name;
   config::StorebagAnswer answer;
@@ -60,10 +59,10 @@ struct StorebagFacts {
   std::vector<std::int32_t> typesWithout;  // asked for, and without a storebag
 };
 
-// The server gave no answer, so that it need not be asked for another one.
+// True if the server gave no answer, so that further storebags need not be requested.
 bool endsAtServer(config::StorebagCause cause);
 
-// policyBroken, reportingOff: the word of the device's owner, which stands above consent.
+// policyBroken, reportingOff: the owner's decision, which overrides consent.
 enum class Consent { given, refused, neverGiven, noBoolean, notKnown, policyBroken, reportingOff };
 
 struct MachineFacts {
@@ -77,10 +76,10 @@ struct MachineFacts {
   double now = 0;                       // seconds since 1970
 };
 
-// Fewer descriptors do not carry a start, a few clients and a post each.
+// Fewer descriptors are not enough for a start and a few clients with a post each.
 inline constexpr std::uint64_t kFewestDescriptors = 100;
 
-// All that the daemon decides, in the order of wire::check::kNames after "daemon".
+// All checks of the daemon, in the order of wire::check::kNames after "daemon".
 std::vector<Check> diagnose(const EntitlementFacts& entitlement, const AddressFacts& address,
                             const StorebagFacts& storebags, const MachineFacts& machine);
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where each fact comes from.
+// Collects each fact from its source.
 #include "daemon/doctor.h"
 
 #include <sys/resource.h>
@@ -112,7 +112,7 @@ StorebagFacts Doctor::storebags(StorebagCache& cache, const std::vector<std::int
 }
 
 Consent Doctor::consent() {
-  const auto refusal = _services.gate.word()->refusal;
+  const auto refusal = _services.gate.decision()->refusal;
   if (refusal == wire::Reason::policy_broken) return Consent::policyBroken;
   if (refusal == wire::Reason::policy_reporting || refusal == wire::Reason::privacy_off)
     return Consent::reportingOff;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Gathers the facts that `veltractl doctor` is answered from. The asking thread, which may wait for the
-// storebag server.
+// Collects the facts for `veltractl doctor`. Runs on the caller's thread, which may wait for the storebag
+// server.
 #pragma once
 
 #include <cstdint>
@@ -25,14 +25,14 @@ namespace veltrad::daemon {
 
 class StorebagCache;
 
-// Any thread. What the constructor takes outlives it.
+// Any thread. The constructor's arguments must outlive it.
 class Doctor {
  public:
   Doctor(Services& services, config::ProcessSettings& settings, config::StorebagSource& source,
          platform::SandboxState sandbox);
 
-  // Fetches the storebags of these client types, or without any those that sessions have asked for since the
-  // start, else all; what it gets is used for nothing else, and the cache stays as it is. {"version", "pid",
+  // Fetches the storebags of these client types; without any, those that sessions have asked for since the
+  // start, or all. The storebags are not used otherwise, and the cache does not change. {"version", "pid",
   // "checks": [{"name", "result", "text", "mend"}]}
   Dictionary examine(ipc::Connection& caller, StorebagCache& cache, const std::vector<std::int32_t>& types);
 

@@ -22,7 +22,7 @@ std::string userInfoKeyForUserInfo(const Dictionary* userInfo) {
   return (client ? lowerCase(*client) : "") + ":" + (service ? lowerCase(*service) : "");
 }
 
-// For log lines: the key, unless the owner of the device keeps back what it is made of.
+// For log lines: the key, unless the owner of the device withholds one of its parts.
 const char* shown(const std::string& key, const session::FamilyFacts& facts) {
   return facts.userInfo == facts.sentUserInfo ? key.c_str() : "(kept back)";
 }

@@ -18,9 +18,9 @@
 
 namespace veltrad::daemon {
 
-// Any thread. Does not call sessions; it knows what they have told it. Under its lock it reads and sets
-// states and IDs of back ends, and queues copies and end marks, none of which block. The results of a refresh
-// are set under the lock, because they must not overwrite those of a later one.
+// Any thread. Does not call sessions; it uses the facts that they have registered. Under its lock it reads
+// and sets states and IDs of back ends, and queues copies and end marks, none of which block. The results of
+// a refresh are set under the lock, because they must not overwrite those of a later one.
 class Families {
  public:
   // Does nothing if the session is in no family.
@@ -42,7 +42,7 @@ class Families {
  private:
   using Members = std::unordered_map<const session::Aggregation*, FamilyMember>;
 
-  // What these return or swap out is destroyed after the lock is released.
+  // Objects that these return or swap out must be destroyed after the lock is released.
   void tell(FamilyMember& member, session::FamilyFacts& facts, std::string& key) REQUIRES(_lock);
   Members::node_type takeOut(const session::Aggregation& session) REQUIRES(_lock);
   const CorrelatedList* list(std::string_view key) const REQUIRES(_lock);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads the files of the history for those who ask.
+// Reads the files of the history for questions on the control socket.
 #include "daemon/history_answers.h"
 
 #include <chrono>

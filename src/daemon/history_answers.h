@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers to questions about the history of what left. Any thread.
+// Answers questions about the history on the control socket. Any thread.
 #pragma once
 
 #include <string>

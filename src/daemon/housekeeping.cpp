@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Attempts each step of a tick by itself.
+// Runs each task of a tick separately.
 #include "daemon/housekeeping.h"
 
 #include <algorithm>
@@ -18,8 +18,8 @@ using namespace std::chrono_literals;
 
 // How often the counters are written and the watchdog is fed.
 constexpr std::chrono::milliseconds kTick = 1000ms;
-// How often the owner's word is read again in that time: a change and the end of what is under way, which
-// takes one more time, are done within a second.
+// How often the owner's decision is read in that time. A change, and the end of running requests one reading
+// later, take effect within a second.
 constexpr int kOwnerTicks = 3;
 // The last threads may still be ending.
 constexpr int kTicksToReturnMemory = 3;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the main thread does while the daemon serves: several times a second, and once a second.
+// The periodic tasks of the main thread while the daemon serves: several times a second, and once a second.
 #pragma once
 
 #include <chrono>
@@ -27,10 +27,10 @@ struct StateFiles {
   platform::StateFile& destinations;
 };
 
-// What finds no memory does not hold up the rest, and is done again at the next tick.
+// A task that fails for lack of memory does not stop the others, and is repeated at the next tick.
 class Housekeeping {
  public:
-  // What it takes outlives it.
+  // The constructor's arguments must outlive it.
   Housekeeping(Services& services, Daemon& daemon, ipc::Listener& listener, const StateFiles& files);
 
   // Between two ticks.

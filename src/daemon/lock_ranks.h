@@ -4,7 +4,7 @@
 
 #include "base/mutex.h"
 
-// Below all levels, because the owner's word is passed to all sessions under it.
+// Below all levels, because the owner's decision is passed to all sessions under it.
 #define OWNER_LOCK                                  \
   ACQUIRED_AFTER(::veltrad::lock_order::above0)     \
   ACQUIRED_BEFORE(::veltrad::lock_order::below10) { \

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Each check by itself.
+// The checks, each in a function.
 #include "daemon/machine_checks.h"
 
 #include <fmt/chrono.h>

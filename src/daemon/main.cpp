@@ -32,10 +32,9 @@ using namespace std::chrono_literals;
 
 // The longest time from the signal to the end of the process.
 constexpr auto kStopBound = 10s;
-// What of it is left to a spool for the posts that have no answer until then.
+// The part of it that is reserved for the spool to keep unanswered posts.
 constexpr std::chrono::milliseconds kTimeToKeep = 3s;
-// Connections to the control socket: in all, of one user, and those that root and the daemon's own user alone
-// may have.
+// Connections to the control socket: in all, of one user, and reserved for root and the daemon's own user.
 constexpr std::size_t kMostObservers = 64;
 constexpr std::size_t kMostObserversOfOneUser = 32;
 constexpr std::size_t kObserversForOwner = 2;
@@ -120,7 +119,7 @@ Result<Sockets, std::string> openSockets(daemon::Services& services) {
   return Sockets{std::move(service.value()), std::move(control.value())};
 }
 
-// Counts in a file that outlives a kill, if it can be had.
+// Keeps the counts in a file that survives a kill, if it can be made.
 void keepCounts(daemon::Services& services, std::optional<platform::CountsRecord>& kept, double started) {
   auto record = platform::CountsRecord::open(services.root.countsPath(), services.files,
                                              services.root.countersPath(), started);
@@ -142,7 +141,7 @@ platform::StateFile::State countersState(const platform::Counters& counters, dou
           [&counters, started] { return counters.json(started); }};
 }
 
-// This and the next are not written before the first thing has left.
+// This file and the next are not written before anything has left.
 platform::StateFile::State allowanceState(const config::DailyAllowance& allowance) {
   return {"The day's account", [&allowance] { return platform::StateFile::Version{allowance.version()}; },
           [&allowance] { return allowance.text(); }, platform::StateFile::Version{}};
@@ -198,7 +197,7 @@ bool stop(daemon::Services& services, daemon::Daemon& daemon, ipc::Listener& lis
   return stuck == 0 && kept && written;
 }
 
-// Prints what one of the two known arguments asks for. False: there is none, and others are not read.
+// Handles the two known arguments. False if there is neither; other arguments are ignored.
 bool answerArguments(int count, char** arguments) {
   for (int i = 1; i < count; ++i) {
     const std::string_view argument = arguments[i];
@@ -212,6 +211,66 @@ bool answerArguments(int count, char** arguments) {
     }
   }
   return false;
+}
+
+// What stands before the daemon is made.
+struct Prepared {
+  daemon::Services& services;
+  Sockets sockets;
+  platform::SandboxState sandbox;
+  std::optional<platform::CountsRecord>& countsRecord;
+  double started;
+};
+
+// Serves until a signal. Returns the exit status.
+int serveAndStop(Prepared prepared, platform::RunLoop& loop) {
+  daemon::Services& services = prepared.services;
+  services.writer.start();
+  const auto stateFile = [&services](platform::StateFile::State state, const std::string& path) {
+    return platform::StateFile(std::move(state), services.files, services.writer, path);
+  };
+  platform::StateFile countersFile =
+      stateFile(countersState(services.counters, prepared.started), services.root.countersPath());
+  platform::StateFile allowanceFile =
+      stateFile(allowanceState(services.allowance), services.root.allowancePath());
+  platform::StateFile destinationsFile =
+      stateFile(destinationsState(services.destinations), services.root.destinationsPath());
+  services.history.mend();
+  services.allowance.load();
+  services.destinations.load();
+  services.gate.refresh();
+  daemon::Daemon daemon(services);
+  ipc::Listener listener({std::move(prepared.sockets.service), services.entitlements, services.lentFiles,
+                          services.counters, services.memory, services.root.entitlementsPath()},
+                         daemon.agent());
+  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(prepared.sandbox));
+  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
+                              daemon.spool(), prepared.started);
+  ipc::Listener control({std::move(prepared.sockets.control), services.entitlements, services.lentFiles,
+                         services.counters, services.observersMemory, services.root.entitlementsPath(),
+                         kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
+                        observers);
+  platform::StateFile metricsFile = stateFile(metricsState(observers), services.root.metricsPath());
+  daemon.startSpool();
+  if (!listener.resume() || !control.resume()) {
+    services.http.failBlockingWaits();
+    daemon.stopSpool();
+    services.http.drain(std::chrono::steady_clock::now());
+    return 1;
+  }
+  platform::forbidExit();
+  services.serviceManager.ready();
+  logInfo("main: Listener resumes with sandbox, start loop.");
+  const daemon::StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
+  daemon::Housekeeping housekeeping(services, daemon, listener, files);
+  serve(housekeeping, loop);
+  const bool ended = stop(services, daemon, listener, control, files);
+  if (ended && prepared.countsRecord) prepared.countsRecord->told();
+  daemon.backends().sayRest();
+  platform::VeltraLogging::stopLogging();
+  if (!ended) _exit(0);
+  platform::allowExit();
+  return 0;
 }
 
 }  // namespace
@@ -239,50 +298,6 @@ int main(int count, char** arguments) {
   }
   removeUnfinishedFiles(services.root);
   keepCounts(services, countsRecord, started);
-
-  services.writer.start();
-  platform::StateFile countersFile(countersState(services.counters, started), services.files, services.writer,
-                                   services.root.countersPath());
-  platform::StateFile allowanceFile(allowanceState(services.allowance), services.files, services.writer,
-                                    services.root.allowancePath());
-  platform::StateFile destinationsFile(destinationsState(services.destinations), services.files,
-                                       services.writer, services.root.destinationsPath());
-  services.history.mend();
-  services.allowance.load();
-  services.destinations.load();
-  services.gate.refresh();
-  daemon::Daemon daemon(services);
-  ipc::Listener listener({std::move(sockets.value().service), services.entitlements, services.lentFiles,
-                          services.counters, services.memory, services.root.entitlementsPath()},
-                         daemon.agent());
-  daemon::Doctor doctor(services, daemon.settings(), daemon.storebags(), std::move(sandbox));
-  daemon::Observers observers(services, daemon.agent(), listener, doctor, daemon.privacy(), daemon.fates(),
-                              daemon.spool(), started);
-  ipc::Listener control({std::move(sockets.value().control), services.entitlements, services.lentFiles,
-                         services.counters, services.observersMemory, services.root.entitlementsPath(),
-                         kMostObservers, kMostObserversOfOneUser, kObserversForOwner, ""},
-                        observers);
-  platform::StateFile metricsFile(metricsState(observers), services.files, services.writer,
-                                  services.root.metricsPath());
-  daemon.startSpool();
-  if (!listener.resume() || !control.resume()) {
-    services.http.failBlockingWaits();
-    daemon.stopSpool();
-    services.http.drain(std::chrono::steady_clock::now());
-    return 1;
-  }
-  platform::forbidExit();
-  services.serviceManager.ready();
-  logInfo("main: Listener resumes with sandbox, start loop.");
-  const daemon::StateFiles files{countersFile, metricsFile, allowanceFile, destinationsFile};
-  daemon::Housekeeping housekeeping(services, daemon, listener, files);
-  serve(housekeeping, loop);
-
-  const bool ended = stop(services, daemon, listener, control, files);
-  if (ended && countsRecord) countsRecord->told();
-  daemon.backends().sayRest();
-  platform::VeltraLogging::stopLogging();
-  if (!ended) _exit(0);
-  platform::allowExit();
-  return 0;
+  return serveAndStop({services, std::move(sockets.value()), std::move(sandbox), countsRecord, started},
+                      loop);
 }

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The daemon's metrics as OpenMetrics text.
+// Formats the daemon's metrics as OpenMetrics text.
 #pragma once
 
 #include <cstddef>

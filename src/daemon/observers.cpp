@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The table of questions, and who may ask which.
+// The table of questions, with the right that each needs.
 #include "daemon/observers.h"
 
 #include <fmt/format.h>
@@ -30,7 +30,7 @@ struct Observers::Question {
   std::string_view name;
   Right right;
   Answer (Observers::*answer)(const Dictionary& arguments);
-  // Instead, where the answer depends on who asks.
+  // Used instead if the answer depends on the caller.
   Answer (Observers::*answerTo)(const Dictionary& arguments, Desk& desk) = nullptr;
 };
 
@@ -64,7 +64,7 @@ const Observers::Question* Observers::questionNamed(const std::string& name) {
   return nullptr;
 }
 
-// One connection's questions.
+// Answers the questions of one connection.
 class Observers::Desk final : public ipc::Observer {
  public:
   // The connection holds its desk.
@@ -153,7 +153,7 @@ Observers::Answer Observers::status(const Dictionary&) {
 
 Observers::Answer Observers::sessions(const Dictionary& arguments) {
   const Value* after = arguments.find("after");
-  return statusOfSessions(_agent, *_services.gate.word(),
+  return statusOfSessions(_agent, *_services.gate.decision(),
                           static_cast<std::uint64_t>(after ? after->toInt64().value_or(0) : 0));
 }
 
@@ -194,7 +194,7 @@ Observers::Answer Observers::doctor(const Dictionary& arguments, Desk& desk) {
   return _doctor.examine(desk.connection(), _agent.storebags(), types);
 }
 
-// The entries from a position on, as they lie in the ring.
+// The entries from a position on, as they are in the ring.
 Observers::Answer Observers::fates(const Dictionary& arguments) {
   // They and the rest of the answer stay below a frame's bound.
   constexpr std::size_t kMost = 8192;
@@ -210,7 +210,8 @@ Observers::Answer Observers::fates(const Dictionary& arguments) {
                     {"size", _fates.size()},       {"refresh", _fates.refresh()}};
 }
 
-// What messages hold, from a position on. The first question has none: from now on.
+// The contents of messages from a position on. The first question has no position: it starts with the next
+// message.
 Observers::Answer Observers::contents(const Dictionary& arguments, Desk& desk) {
   platform::WatchedContents& contents = _fates.contents();
   desk.watchContents(contents);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What those who look after the device are answered on the control socket.
+// Answers the questions of administrators on the control socket.
 #pragma once
 
 #include <memory>
@@ -27,20 +27,20 @@ namespace veltrad::daemon {
 class Doctor;
 class VeltradAgent;
 
-// Each connection's thread asks on its own. Nothing of it opens a session or a transaction. What the
-// constructor takes outlives it, the listener of clients included.
+// Used by the threads of all observers' connections. Questions open neither a session nor a transaction. The
+// arguments of the constructor, the listener of clients included, must outlive it.
 class Observers final : public ipc::ListenerDelegate {
  public:
   // `started`: of the process, seconds since 1970.
   Observers(Services& services, VeltradAgent& agent, ipc::Listener& clients, Doctor& doctor, Privacy& privacy,
             platform::FateRing& fates, backends::PostSpool* spool, double started);
 
-  // Whoever connects is accepted; each question asks for its entitlement.
+  // Accepts every peer; each question checks its entitlement.
   bool listener(ipc::Listener& listener, const std::shared_ptr<ipc::Connection>& connection) override;
 
   // Any thread.
   Gauges gauges();
-  // Of all counts, which only grow.
+  // The sum of all counts, which only grow.
   std::uint64_t countsTotal() const { return _services.counters.total(); }
   std::string metricsText();
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Hears the owner of the device, and answers.
+// Applies changes of the owner's decision, and answers questions about it.
 #include "daemon/privacy.h"
 
 #include <dirent.h>
@@ -33,7 +33,7 @@ bool isIdentifier(std::string_view key) {
          key.starts_with(kCustomIdentifier);
 }
 
-// Of the regular files in a directory whose names begin so.
+// The size of the regular files in a directory whose names have this prefix.
 std::uint64_t bytesIn(const std::string& directory, std::string_view beginning) {
   std::uint64_t bytes = 0;
   const std::unique_ptr<DIR, int (*)(DIR*)> opened(::opendir(directory.c_str()), ::closedir);
@@ -61,22 +61,23 @@ void Privacy::hearOwner() {
   _graceRuns = changed;
 }
 
-// True if the word has changed. What there is no memory for is done at the next call.
+// True if the decision has changed. A step that fails for lack of memory is repeated at the next call.
 bool Privacy::obey() {
   _toBeTold = _services.gate.refresh() || _toBeTold;
   if (!_toBeTold) return false;
-  const auto word = _services.gate.word();
+  const auto decision = _services.gate.decision();
   logInfo("hearOwner: The owner's word has changed: %s",
-          word->refusal ? wire::entryOf(*word->refusal).name.data() : "back ends may report");
-  _agent.tellOwnersWord(*word);
-  _factory.dropWaiting(
-      [&word](const std::string& host) { return word->refusal.has_value() || !word->policy->reaches(host); });
+          decision->refusal ? wire::entryOf(*decision->refusal).name.data() : "back ends may report");
+  _agent.tellOwnerDecision(*decision);
+  _factory.dropWaiting([&decision](const std::string& host) {
+    return decision->refusal.has_value() || !decision->policy->reaches(host);
+  });
   _toBeTold = false;
   return true;
 }
 
 const char* Privacy::reporting() const {
-  const auto refusal = _services.gate.word()->refusal;
+  const auto refusal = _services.gate.decision()->refusal;
   return refusal == wire::Reason::privacy_off || refusal == wire::Reason::policy_reporting ||
                  refusal == wire::Reason::policy_broken
              ? "off"
@@ -89,13 +90,14 @@ Privacy::Answer Privacy::show() {
   if (!consent) return Failure{consent.error().description};
   auto known = identifiers();
   if (!known) return Failure{known.error()};
-  const auto word = _services.gate.word();
+  const auto decision = _services.gate.decision();
   const auto& given = consent.value();
-  return Dictionary{{"reporting", reporting()},
-                    {"consent", given ? Value(given->toBoolean().value_or(false)) : nullValue()},
-                    {"policy", word->policy->broken() ? Value("broken") : orNull(word->policy->asGiven())},
-                    {"identifiers", std::move(known.value())},
-                    {"destinations", _services.destinations.lastDay()}};
+  return Dictionary{
+      {"reporting", reporting()},
+      {"consent", given ? Value(given->toBoolean().value_or(false)) : nullValue()},
+      {"policy", decision->policy->broken() ? Value("broken") : orNull(decision->policy->asGiven())},
+      {"identifiers", std::move(known.value())},
+      {"destinations", _services.destinations.lastDay()}};
 }
 
 Result<Array, std::string> Privacy::identifiers() {
@@ -133,7 +135,7 @@ Privacy::Answer Privacy::turnOff() {
     static_cast<void>(receipt.end());
     return Failure{stored.error()};
   }
-  // First, so that all is counted here: the spool drops it by itself once the word has changed.
+  // First, so that all posts are counted here: the spool drops them by itself once the decision has changed.
   std::size_t posts = emptySpool(wire::Reason::privacy_off);
   _graceRuns = obey() || _graceRuns;
   const auto begun = _services.http.refuseWaiting(false, kHTTPPatience);
@@ -197,7 +199,7 @@ Privacy::Answer Privacy::resetIdentifiers() {
   }
   _services.gate.identifiersReset();
   _graceRuns = obey() || _graceRuns;
-  // What waits bears the identifiers before. Sessions take the new ones at their next call.
+  // Waiting data contains the old identifiers. Sessions take the new ones at their next call.
   std::size_t posts = emptySpool(wire::Reason::refused_by_owner);
   static_cast<void>(_services.http.refuseWaiting(true, kHTTPPatience));
   _agent.dropIdentified();

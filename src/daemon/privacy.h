@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the owner of the device asks for: reporting off and on, other identifiers, and what there is to know
-// of what leaves. Any thread.
+// Serves the owner of the device: turns reporting off and on, resets identifiers, and shows what may leave
+// and what left. Any thread.
 #pragma once
 
 #include <chrono>
@@ -29,13 +29,13 @@ class Privacy {
  public:
   using Answer = Result<Dictionary, std::string>;
 
-  // What it takes outlives it; `spool` may be null.
+  // The constructor's arguments must outlive it; `spool` may be null.
   Privacy(Services& services, VeltradAgent& agent, backends::BackendFactory& factory,
           const support::Veltra& library, backends::PostSpool* spool)
       : _services(services), _agent(agent), _factory(factory), _library(library), _spool(spool) {}
 
-  // Reads the owner's word again and, if it has changed, stops what may not leave any more. Main thread,
-  // several times a second.
+  // Reads the owner's decision again and, if it has changed, stops everything that may no longer leave. Main
+  // thread, several times a second.
   void hearOwner();
 
   // {"reporting": "on" or "off", "consent": boolean, or not a number where it was never asked for, "policy":
@@ -50,7 +50,7 @@ class Privacy {
 
  private:
   bool obey() REQUIRES(_mutex);
-  // Returns how many posts that were.
+  // Empties the spool, if there is one. Returns the number of posts.
   std::size_t emptySpool(wire::Reason why);
   const char* reporting() const;
   Result<Array, std::string> identifiers();
@@ -62,11 +62,11 @@ class Privacy {
   const support::Veltra& _library;
   backends::PostSpool* const _spool;
 
-  // One at a time hears the owner.
+  // Allows one refresh of the owner's decision at a time.
   Mutex _mutex OWNER_LOCK;
-  // The word has changed, and requests that had begun have been given until the next call.
+  // The decision has changed, and requests that have begun may run until the next call.
   bool _graceRuns GUARDED_BY(_mutex) = false;
-  // The word has changed, and not everybody was told.
+  // The decision has changed, and not all back ends were told.
   bool _toBeTold GUARDED_BY(_mutex) = false;
 };
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A fetch's answer in the words of those who asked.
+// Converts the answer of a fetch for the control socket.
 #include "daemon/refresh.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// `veltractl refresh`: one storebag fetched now. The asking thread, which waits for the server.
+// `veltractl refresh`: fetches one storebag now. The caller's thread, which waits for the server.
 #pragma once
 
 #include <string>
@@ -12,9 +12,9 @@ namespace veltrad::daemon {
 class StorebagCache;
 
 // {"name", "result": "fetched" | "refused" | "failed", "signature": "good" | "bad", "reason", "version"}.
-// refused: the server gave something that is not used; failed: it gave nothing. "version" is of what is in
-// use from then on. What there is not is not a number. Fails for a name that no client type has, with one
-// line that lists the names.
+// refused: the server gave something that is not used; failed: it gave nothing. "version" is that of the
+// storebag in use afterwards. Missing values are NaN. Fails for a name that no client type has, with one line
+// that lists the names.
 Result<Dictionary, std::string> refreshStorebag(StorebagCache& cache, const std::string& name);
 
 }  // namespace veltrad::daemon

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What to do about a storebag that a rule of the operator refuses. A plain function; any thread.
+// The advice for a storebag that a rule of the operator refuses. Pure functions; any thread.
 #pragma once
 
 #include <string>
@@ -17,7 +17,7 @@ struct RefusalPlaces {
 // One line. `reason`: of concern "storebag".
 std::string adviceOn(wire::Reason reason, const RefusalPlaces& places);
 
-// It is the signature that is refused, and not what the storebag says.
+// True if the signature was refused, not the claims of the storebag.
 bool concernsSignature(wire::Reason reason);
 
 }  // namespace veltrad::daemon

@@ -51,7 +51,7 @@ struct Services {
 
   const platform::Root root;
   platform::MemoryBudget memory;
-  // Of the control socket, so that clients that keep much do not keep those out who look for the reason.
+  // For the control socket, so that clients that use much memory do not lock out administrators.
   platform::MemoryBudget observersMemory{{16u << 20, 8u << 20, 4u << 20, 32u << 20, 16u << 20}};
   platform::SystemClock clock;
   platform::UnseededSequence random;

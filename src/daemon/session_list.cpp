@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Sessions come, tell of themselves and go.
+// Adds, updates and removes sessions.
 #include "daemon/session_list.h"
 
 #include <algorithm>

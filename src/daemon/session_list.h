@@ -25,12 +25,12 @@ struct ListedSession {
 
 class SessionList {
  public:
-  // `transaction` outlives it.
+  // `transaction` must outlive it.
   explicit SessionList(platform::Transaction& transaction) : _transaction(transaction) {}
 
   void add(std::shared_ptr<session::VeltradSession> session);
   void remove(const session::VeltradSession& session);
-  // What the session says of itself now; nothing for one that is not in the list.
+  // Updates the facts of a session; ignored for a session that is not in the list.
   void tell(session::FamilyFacts facts);
 
   // In the order of arrival.

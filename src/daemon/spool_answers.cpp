@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the spool, and its files for what only they know.
+// Reads the spool's state, and its files for details that only they hold.
 #include "daemon/spool_answers.h"
 
 #include <algorithm>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What those who look after the device are answered about the spool. The asking thread. The spool may be
-// null.
+// Answers the questions about the spool on the control socket. The caller's thread. The spool may be null.
 #pragma once
 
 #include <string>
@@ -15,7 +14,7 @@ class PostSpool;
 namespace veltrad::daemon {
 
 // {"posts", "bytes", "oldest", "addresses": [{"address", "posts", "bytes", "oldest", "nextTry",
-// "lastError"}]}; not a number without a spool. What is not known is not a number, too.
+// "lastError"}]}; NaN without a spool. Unknown values are NaN.
 Value statusOfSpool(backends::PostSpool* spool);
 
 // {"posts": [what is kept, and its tries], "next": "after" of the next question, where there is more}.

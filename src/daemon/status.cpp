@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the rooms know of themselves, put together for those who ask.
+// Collects the status of all rooms.
 #include "daemon/status.h"
 
 #include <dirent.h>
@@ -56,13 +56,13 @@ Dictionary statusOfBackend(const backends::VeltraBackend& backend) {
           {"lastOutcome", activity.lastOutcome.empty() ? nullValue() : activity.lastOutcome}};
 }
 
-Dictionary statusOfSession(const ListedSession& listed, const config::OwnersWord& word) {
+Dictionary statusOfSession(const ListedSession& listed, const config::OwnerDecision& decision) {
   const session::FamilyFacts& facts = listed.facts;
   const Dictionary* info = facts.sessionInfo.get();
-  // The session itself may not have heard the word yet.
+  // The session itself may not have applied the latest decision yet.
   Dictionary user = facts.userInfo ? *facts.userInfo : Dictionary();
   config::EditedFields edits;
-  if (word.fields) word.fields->apply(user, edits);
+  if (decision.fields) decision.fields->apply(user, edits);
   const auto clientType = info ? info->int32(wire::kVeltraSessionInfoClientType) : std::nullopt;
   Array backends;
   if (facts.backends) {
@@ -136,7 +136,7 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers) {
   return all;
 }
 
-Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after) {
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnerDecision& decision, std::uint64_t after) {
   // With five back ends each and long names, so many sessions stay below a frame's bounds.
   constexpr std::size_t kMost = 200;
   const auto all = agent.sessions();
@@ -151,7 +151,7 @@ Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word,
       more = true;
       break;
     }
-    Dictionary status = statusOfSession(listed, word);
+    Dictionary status = statusOfSession(listed, decision);
     const auto parent = parents.find(listed.facts.aggregation.get());
     const auto number = parent == parents.end() ? numbers.end() : numbers.find(parent->second);
     if (number != numbers.end()) status.set("parent", number->second);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What `veltractl status` shows of the running daemon, as property list values. The asking thread.
+// The status of the running daemon for `veltractl status`, as property list values. The caller's thread.
 #pragma once
 
 #include <cstdint>
@@ -9,7 +9,7 @@
 #include "base/value.h"
 
 namespace veltrad::config {
-struct OwnersWord;
+struct OwnerDecision;
 }  // namespace veltrad::config
 
 namespace veltrad::http {
@@ -29,8 +29,8 @@ struct Limit {
   std::uint64_t limit = 0;
 };
 
-// Of this process, from /proc: resident memory in bytes, and open descriptors beside the most that it may
-// have. 0 where /proc cannot be read.
+// Resident memory of this process in bytes, and its open descriptors with their limit, from /proc. 0 if /proc
+// cannot be read.
 std::uint64_t residentBytes();
 Limit descriptorLimit();
 
@@ -43,9 +43,9 @@ struct DaemonFacts {
 // {"version", "pid", "uptime", "memory": {"resident"}, "limits": [{"name", "used", "limit"}]}
 Dictionary statusOfDaemon(const DaemonFacts& facts);
 
-// One for each name that a client type has, also where nobody has asked for it:
-// {"name", "version", "age", "state": "successful" | "failed" | "never", "nextAttempt"}. What is not known is
-// not a number, which JSON writes as null; so in all that follows.
+// One for each storebag name of a client type, even if no session has asked for it: {"name", "version",
+// "age", "state": "successful" | "failed" | "never", "nextAttempt"}. Unknown values are NaN, which JSON
+// writes as null; so in all answers below.
 Array statusOfStorebags(StorebagCache& cache, double now);
 
 // {"address", "lastSuccess", "failures"}
@@ -54,8 +54,8 @@ Array statusOfServers(const std::vector<http::ServerRecord>& servers);
 // The sessions that came after number `after`, in the order of arrival, as many as one reply can carry:
 // {"sessions": [{"id", "parent", "clientType", "sessionID", "clientName", "serviceName", "backends":
 // [{"name", "state", "reason": {"name", "text"}, "held", "underWay", "lastOutcome"}]}], "more": true where
-// there are others}. "id" is the number, "parent" that of the parent session, if there is one. Of a name, the
-// first 256 bytes; names that the owner keeps back stay back.
-Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnersWord& word, std::uint64_t after);
+// there are others}. "id" is the number, "parent" that of the parent session, if there is one. Names are
+// truncated to 256 bytes; names that the owner withholds are left out.
+Dictionary statusOfSessions(VeltradAgent& agent, const config::OwnerDecision& decision, std::uint64_t after);
 
 }  // namespace veltrad::daemon

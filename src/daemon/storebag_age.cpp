@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Compares the age of a storebag with its wait.
+// Computes the wait for a storebag and compares it with the age.
 #include "daemon/storebag_age.h"
 
 #include <algorithm>

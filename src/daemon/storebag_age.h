@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// When a storebag is asked for again. Values in, verdicts out: all times are seconds of one clock. The owner
-// guards it.
+// Decides when a storebag is fetched again. All times are seconds of one clock. The owner guards it.
 #pragma once
 
 #include <cstdint>
@@ -11,22 +10,22 @@ enum class CacheVerdict { serve, wait, fetch };
 
 inline constexpr int kSecondsBetweenAttempts = 900;
 
-// How the last attempt to fetch a storebag has ended.
+// The result of the last attempt to fetch a storebag.
 struct StorebagAge {
   bool attempted = false;
   bool fetchSuccessful = false;
   double fetchTime = 0;
-  // In seconds: what this attempt was told, and what the last successful one was told; 0: there was none.
+  // In seconds: the max age of this attempt, and that of the last successful one; 0 if there was none.
   std::int32_t maxAge = 0;
   std::int32_t lifetime = 0;
   // In [0, 1), drawn for this attempt: where between its bounds the wait lies.
   double draw = 0;
 
   void ended(bool successful, std::int32_t told, double now, double drawn);
-  // Seconds from its end to the next attempt. With a jitter of 0 the max age, or 900 after a failure. With
-  // one up to 1, a success is followed up to that share of its max age sooner, and a failure up to that share
-  // of the lifetime later (of 900 s at least, of a day at most): what failed together does not come back
-  // together.
+  // Seconds from its end to the next attempt. With a jitter of 0 this is the max age, or 900 after a failure.
+  // With a jitter up to 1, it is up to that share of the max age shorter after a success, and up to that
+  // share of the lifetime (of 900 s at least, of a day at most) longer after a failure, so that devices that
+  // failed together spread out.
   double wait(double jitter) const;
 };
 

@@ -24,7 +24,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
     StorebagRecord& record = settledRecord(name);
     auto section = used(record);
     const CacheVerdict verdict = verdictOf(record);
-    // What has expired while it was fresh is asked for again.
+    // A fresh storebag that has expired is fetched again.
     if (verdict == CacheVerdict::serve && (section || !record.data)) {
       logDebug("storebagForSession: Cached storebag found for client type %d", clientType);
       return section;
@@ -36,7 +36,7 @@ std::shared_ptr<const config::StorebagSection> StorebagCache::storebagForClientT
           clientType, static_cast<int>(std::ceil(record.wait(_source.jitter()))));
       return section;
     }
-    // What is not to be used must come whole, or not at all.
+    // A section that may not be used must be replaced by a complete answer, so the request is unconditional.
     if (section || !record.data) lastModified = record.lastModified;
     record.beingFetched = true;
   }

@@ -26,9 +26,9 @@ struct StorebagRecord : StorebagAge {
   // Why the last attempt's storebag was refused by a rule of the operator; empty: it was not.
   std::string refusal;
   std::optional<wire::Reason> refusalReason;
-  // It was logged that the section is not to be used any more.
+  // It was logged that the section may no longer be used.
   bool saidUnused = false;
-  // What an earlier daemon has kept was looked at.
+  // The section that an earlier daemon has kept was read.
   bool recalled = false;
   // Requests for this name wait.
   bool beingFetched = false;
@@ -36,7 +36,7 @@ struct StorebagRecord : StorebagAge {
 
 class StorebagCache final : public backends::SectionSource {
  public:
-  // Both outlive it.
+  // Both must outlive it.
   StorebagCache(config::StorebagSource& source, const platform::Clock& clock)
       : _source(source), _clock(clock) {}
 
@@ -44,11 +44,11 @@ class StorebagCache final : public backends::SectionSource {
   std::shared_ptr<const config::StorebagSection> storebagForClientType(std::int32_t clientType);
   // The same for the spool; with `fetch` false, what the record holds.
   std::shared_ptr<const config::StorebagSection> sectionFor(std::int32_t clientType, bool fetch) override;
-  // Fetches the storebag of a client type that has one, however fresh or failed its record is, without a
-  // condition, and takes the answer into the record as ever. May wait as above, and then for the server.
+  // Fetches the storebag of a client type that has one, unconditionally and whatever its record is, and takes
+  // the answer into the record as usual. May wait as above, and then for the server.
   config::StorebagAnswer refresh(std::int32_t clientType);
   std::optional<std::string> versionForClientType(std::int32_t clientType);
-  // What a session of the client type would get without a download.
+  // The section that a session of the client type would get without a download.
   struct Standing {
     bool known = false;                                      // a section was fetched
     std::shared_ptr<const config::StorebagSection> section;  // null: none that may be used
@@ -57,8 +57,8 @@ class StorebagCache final : public backends::SectionSource {
     double fetchTime = 0;
   };
   Standing standingForClientType(std::int32_t clientType);
-  // The rule for which there is nothing to use; nothing: there is, or it was never fetched, or for another
-  // reason.
+  // The rule because of which no section can be used; absent if there is a section, or if the reason is
+  // another.
   std::optional<wire::Reason> refusalForClientType(std::int32_t clientType);
   // By name; a record being fetched is as its last attempt left it.
   std::map<std::string, StorebagRecord> records();
@@ -75,7 +75,7 @@ class StorebagCache final : public backends::SectionSource {
   // Waits until the record of this name is not being fetched.
   StorebagRecord& settledRecord(const std::string& name) REQUIRES(_lock);
   CacheVerdict verdictOf(const StorebagRecord& record) const;
-  // The record's section, unless it is not to be used any more.
+  // The record's section, if it may still be used.
   std::shared_ptr<const config::StorebagSection> used(StorebagRecord& record) const REQUIRES(_lock);
   // Takes an answer into the record and returns what the session gets.
   std::shared_ptr<const config::StorebagSection> taken(std::int32_t clientType, StorebagRecord& record,

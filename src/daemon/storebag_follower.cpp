@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Looks at the storebags of open sessions once a second.
+// Checks the storebags of open sessions once a second.
 #include "daemon/storebag_follower.h"
 
 #include <algorithm>
@@ -13,8 +13,8 @@ namespace veltrad::daemon {
 
 namespace {
 
-// Between two fetches of one storebag, whatever its cycle is; and after one that was no attempt, because the
-// daemon was short of something or the owner does not let the server be asked.
+// The minimum time between two fetches of one storebag; and the wait after a fetch that was no attempt,
+// because of a shortage or because the owner forbids the server.
 constexpr std::chrono::milliseconds kShortestCycle{900};
 constexpr std::chrono::seconds kAfterNoAttempt{60};
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Takes open sessions to what their storebags say now, where the operator has chosen so ("openSessions").
+// Updates open sessions when their storebags change, if the operator has chosen so ("openSessions").
 #pragma once
 
 #include <chrono>
@@ -19,8 +19,8 @@ namespace veltrad::daemon {
 class VeltradAgent;
 
 // Fetches the storebags of open sessions when their refresh cycles are over, on a thread of its own that
-// exists from the first such fetch on, and nudges the sessions of a storebag that changed, or is not to be
-// used any more. The main thread calls tick() and stop(). What the constructor takes outlives it.
+// exists from the first such fetch on, and nudges the sessions of a storebag that has changed or may no
+// longer be used. The main thread calls tick() and stop(). The constructor's arguments must outlive it.
 class StorebagFollower {
  public:
   StorebagFollower(VeltradAgent& agent, config::OperatorSettings& choices)
@@ -34,7 +34,8 @@ class StorebagFollower {
 
  private:
   struct Followed {
-    // What the sessions were nudged for; nothing: they were not. Null: there is none that may be used.
+    // The section for which the sessions were nudged last, null if none may be used; absent if they were not
+    // nudged.
     std::optional<std::shared_ptr<const config::StorebagSection>> told;
     std::optional<double> fetchTime;                  // of the record when the last fetch was asked for
     std::chrono::steady_clock::time_point notBefore;  // for the next fetch

@@ -47,12 +47,12 @@ void VeltradAgent::sessionInvalidated(const std::shared_ptr<session::VeltradSess
   _families.leave(session->aggregation());
 }
 
-void VeltradAgent::tellOwnersWord(const config::OwnersWord& word) {
+void VeltradAgent::tellOwnerDecision(const config::OwnerDecision& decision) {
   for (const ListedSession& listed : _sessionList.all()) {
     if (!listed.facts.backends) continue;
     for (const auto& [name, backend] : *listed.facts.backends) {
       const bool fixed = backend->hostsAreFixed();
-      const auto refusal = word.refusalFor(name, fixed ? backend->hosts() : std::vector<std::string>());
+      const auto refusal = decision.refusalFor(name, fixed ? backend->hosts() : std::vector<std::string>());
       // The session itself finds out at its next call whether hosts that change are listed now.
       const bool hostsUnknown = !fixed && !refusal && backend->prohibition() == wire::Reason::policy_hosts;
       if (!hostsUnknown) backend->setProhibition(refusal);

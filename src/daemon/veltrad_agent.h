@@ -19,7 +19,7 @@
 
 namespace veltrad::daemon {
 
-// Outlives the listener and every session. The arguments of the constructor outlive it.
+// Outlives the listener and every session. The arguments of the constructor must outlive it.
 class VeltradAgent final : public ipc::ListenerDelegate, public session::VeltradSessionDelegate {
  public:
   VeltradAgent(const session::SessionServices& services, config::StorebagSource& source,
@@ -52,13 +52,13 @@ class VeltradAgent final : public ipc::ListenerDelegate, public session::Veltrad
   }
   std::string description() const override;
 
-  // Tells the back ends of all sessions what the owner's word is now; those that may not report drop what
-  // waits.
-  void tellOwnersWord(const config::OwnersWord& word);
+  // Applies the owner's decision to the back ends of all sessions; back ends that may not report drop their
+  // waiting data.
+  void tellOwnerDecision(const config::OwnerDecision& decision);
   // The open sessions by the name of their storebag; those that have none are left out.
   using Followers = std::map<std::string, std::vector<ListedSession>>;
   Followers followers() const;
-  // Drops what waits in the back ends of all sessions and bears the device's identifier.
+  // Drops waiting data with the device's identifier in the back ends of all sessions.
   void dropIdentified();
   std::size_t sessionCount() const { return _sessionList.size(); }
   std::uint64_t acceptedSessions() const { return _sessionList.accepted(); }

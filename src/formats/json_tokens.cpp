@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Splits JSON that was found to be good into tokens.
+// Splits valid JSON into tokens.
 #include "formats/json_tokens.h"
 
 #include <algorithm>

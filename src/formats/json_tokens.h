@@ -31,7 +31,7 @@ class JSONTokens {
   std::size_t _at = 0;
 };
 
-// What the token of a text says.
+// The decoded text of a text token.
 std::string textOfToken(std::string_view token);
 
 }  // namespace veltrad::formats

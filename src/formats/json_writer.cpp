@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Writes values as JSON, makes the readable form of a text, and cuts texts for the log.
+// Writes values as JSON, indents compact JSON, and shortens texts for the log.
 #include <rapidjson/writer.h>
 
 #include <cmath>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the keys and values of a JSON text stand. Any thread.
+// Finds the places of the keys and values of a JSON text. Any thread.
 #include <algorithm>
 #include <charconv>
 

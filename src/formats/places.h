@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the parts of a text stand that is read into a value.
+// The line and column of each part of a parsed text.
 #pragma once
 
 #include <optional>
@@ -11,22 +11,22 @@
 
 namespace veltrad::formats {
 
-// Of a value and all that is in it.
+// The places of a value and all its parts.
 struct Places {
   struct Member;
 
-  // Of the value's first character.
+  // The place of the value's first character.
   TextPlace place;
-  // Of a dictionary, in the order of the text; with each of equal keys, and with JSON keys whose value is
-  // null.
+  // The members of a dictionary, in the order of the text; includes each of equal keys, and JSON keys with
+  // the value null.
   std::vector<Member> members;
-  // Of an array.
+  // The elements of an array.
   std::vector<Places> elements;
 
-  // The member that counts: of equal keys the last. Null if there is none.
+  // The member with this key, the last of equal keys; null if there is none.
   const Member* find(std::string_view key) const;
-  // Of the key or the element of an array that `path` leads to: keys, and numbers of elements from 0 in
-  // decimal. Nothing: it is not there.
+  // The place of the key or array element at `path`: keys, and indices from 0 in decimal. Absent if it does
+  // not exist.
   std::optional<TextPlace> at(const std::vector<std::string>& path) const;
 };
 struct Places::Member {

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where the keys and values of an XML property list stand, with Expat. Any thread.
+// Finds the places of the keys and values of an XML property list, with Expat. Any thread.
 #include <expat.h>
 
 #include <memory>

@@ -36,7 +36,7 @@ Element elementNamed(std::string_view name) {
   return Element::unknown;
 }
 
-// What the text of a leaf element must be.
+// The expected text of a leaf element, for errors.
 const char* expectedIn(Element leaf) {
   switch (leaf) {
     case Element::integer:

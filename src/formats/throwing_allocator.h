@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Allocates for RapidJSON, which writes to whatever its own allocator returns.
+// An allocator for RapidJSON that throws, because RapidJSON does not check for null.
 #pragma once
 
 #include <cstddef>
@@ -8,7 +8,7 @@
 
 namespace veltrad::formats {
 
-// Throws std::bad_alloc for want of memory.
+// Throws std::bad_alloc for lack of memory.
 struct ThrowingAllocator {
   static constexpr bool kNeedFree = true;
   static void* Malloc(std::size_t size) { return Realloc(nullptr, 0, size); }

@@ -15,6 +15,7 @@
 
 #include "base/text.h"
 #include "http/header_lines.h"
+#include "http/host_name.h"
 #include "platform/shortage.h"
 
 namespace veltrad::http {
@@ -38,13 +39,6 @@ std::string_view trimmed(std::string_view text) {
   while (!text.empty() && blank(text.front())) text.remove_prefix(1);
   while (!text.empty() && blank(text.back())) text.remove_suffix(1);
   return text;
-}
-
-// The part between "//" and the path.
-std::string hostOf(std::string_view url) {
-  const std::size_t slashes = url.find("//");
-  if (slashes != std::string_view::npos) url.remove_prefix(slashes + 2);
-  return std::string(url.substr(0, url.find_first_of("/?#")));
 }
 
 CURLcode setStore(CURL*, void* context, void* connections) {
@@ -89,7 +83,7 @@ CurlTransfer::CurlTransfer(HTTPRequest request, HTTPCompletion completion, bool 
     : _request(std::move(request)),
       _completion(std::move(completion)),
       _blocking(blocking),
-      _host(hostOf(_request.url)),
+      _host(authorityOf(_request.url)),
       _bodySize(_request.fileBody ? _request.fileBody->bytes : body().size()),
       _arrived(now) {
   const bool waitsForItsLane =
@@ -113,7 +107,7 @@ bool CurlTransfer::attach(CURL* easy, Connections& connections, Time now) {
   options.set(CURLOPT_OPENSOCKETDATA, this);
   options.set(CURLOPT_CLOSESOCKETFUNCTION, Connections::close);
   options.set(CURLOPT_CLOSESOCKETDATA, _connections);
-  // Who asks for a storebag is told whether its server is trusted now, not when a kept connection was made.
+  // A storebag request uses a new connection, so that the server's certificate is checked now.
   const bool fresh = metEndedConnection() || _request.lane == HTTPRequest::Lane::storebag;
   options.set(CURLOPT_FRESH_CONNECT, fresh ? 1L : 0L);
   _connection = Connection::kept;

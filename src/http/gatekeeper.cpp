@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the gate. HTTP thread.
+// Checks requests with the gate. HTTP thread.
 #include "http/gatekeeper.h"
 
 #include <map>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks libcurl's parser of URLs. Any thread.
+// Parses URLs with libcurl. Any thread.
 #include "http/host_name.h"
 
 #include <curl/curl.h>
@@ -18,10 +18,15 @@ std::string hostName(const std::string& url) {
   return host;
 }
 
-std::string addressOf(std::string_view url) {
+std::string_view addressOf(std::string_view url) {
   const std::size_t slashes = url.find("//");
-  const std::size_t host = slashes == std::string_view::npos ? 0 : slashes + 2;
-  return std::string(url.substr(0, url.find_first_of("/?#", host)));
+  return url.substr(0, url.find_first_of("/?#", slashes == std::string_view::npos ? 0 : slashes + 2));
+}
+
+std::string_view authorityOf(std::string_view url) {
+  const std::string_view address = addressOf(url);
+  const std::size_t slashes = address.find("//");
+  return slashes == std::string_view::npos ? address : address.substr(slashes + 2);
 }
 
 }  // namespace veltrad::http

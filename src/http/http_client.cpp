@@ -153,7 +153,7 @@ void CurlHTTPClient::Impl::stop(const HTTPQueue::Predicate& matches) {
   }
 }
 
-// One that is missed for lack of memory is refused when it would begin.
+// A request that is missed here for lack of memory is refused when it would begin.
 void CurlHTTPClient::Impl::endRefused(bool alsoRunning) {
   try {
     refuse(gate.takeRefused(queue));
@@ -283,7 +283,7 @@ void CurlHTTPClient::Impl::complete(Transfers one, HTTPResult result) {
   queue.completed();
 }
 
-// What this end could not begin, or gave up, says nothing of the server.
+// Requests that failed on this side say nothing about the server.
 void CurlHTTPClient::Impl::record(const std::string& host, const HTTPResult& result) {
   const bool own = !result && (result.error().kind == HTTPError::Kind::shortage ||
                                result.error().kind == HTTPError::Kind::stopping ||

@@ -29,6 +29,7 @@ struct FileBody {
   std::uint64_t bytes = 0;
 };
 
+// Its 18 fields are the request, what is known of its events, and its bounds.
 struct HTTPRequest {
   enum class Method { get, post };
   // Decides which limits apply. Storebag requests are always admitted. At most 1,024 event posts are in
@@ -48,13 +49,13 @@ struct HTTPRequest {
   std::optional<FileBody> fileBody;
   // Instead of `body`: one that its sender keeps, too.
   std::shared_ptr<const std::string> sharedBody;
-  // Its sender keeps it and sends it again if it fails, and records it when that has ended. It bears an ID,
-  // so that the server takes it once, however often it comes.
+  // The sender keeps the request, repeats it if it fails, and records its result. It has an ID, so that the
+  // server accepts it only once.
   bool isKept = false;
-  // It was begun before, so that its events have been counted.
+  // The request was begun before, so its events are counted already.
   bool again = false;
-  // What the request and its completion keep, charged by the caller and released after the completion has
-  // run.
+  // The charge for the memory of the request and its completion, made by the caller and released after the
+  // completion has run.
   platform::Charge charge;
   // Events in the body; a file and log data are one.
   std::size_t events = 1;
@@ -77,10 +78,10 @@ struct HTTPRequest {
 
 struct HTTPResponse {
   int status = 0;
-  // Of the last answer; empty if the answer is not kept.
+  // The headers of the last answer; empty if the answer is not kept.
   HTTPHeaders headers;
   std::string body;
-  // What "Retry-After" asks for, at most a day; 0: nothing.
+  // The wait in "Retry-After", at most a day; 0 if there is none.
   std::chrono::seconds retryAfter{0};
   // How often the request went out. libcurl repeats one that a kept connection ends without an answer, if it
   // is kept by its sender.
@@ -99,12 +100,12 @@ struct HTTPError {
   Kind kind = Kind::transport;
   // One line: "Could not resolve host: x".
   std::string description;
-  // Of an incomplete answer; 0 if none arrived.
+  // The status of an incomplete answer; 0 if none arrived.
   int status = 0;
   // Where a transport error ended the exchange.
   enum class Cause { other, resolve, connect, trust, timeout };
   Cause cause = Cause::other;
-  // Of one that was refused.
+  // The reason of a refused request.
   std::optional<wire::Reason> refusal = std::nullopt;
   // The request had begun when it ended so.
   bool begun = false;
@@ -120,7 +121,7 @@ struct HTTPError {
   }
 };
 
-// What the request keeps until its completion has run, including libcurl's copies, without the completion
+// The memory of the request until its completion has run, including libcurl's copies, without the completion
 // itself.
 std::size_t keptBytes(const HTTPRequest& request);
 
@@ -166,8 +167,8 @@ class CurlHTTPClient final : public HTTPClient {
   HTTPResult perform(HTTPRequest request) override;
   bool stopping() const override;
 
-  // Asks the gate again for the requests that wait and, if `running`, for those that have begun; ends those
-  // that it refuses.
+  // Checks the waiting requests with the gate again and, if `running`, those that have begun; ends refused
+  // ones.
   void endRefused(bool running);
   // The same for those that wait, now; with `all`, whatever the gate says of them. Returns what has begun, in
   // both cases without requests for storebags; nothing if that takes longer than `within`.

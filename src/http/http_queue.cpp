@@ -87,7 +87,7 @@ HTTPQueue::Orders HTTPQueue::look() {
   return orders;
 }
 
-// A stop may have been ordered since look(); then nothing more is begun.
+// A stop may have been ordered since look(); then no further transfer begins.
 HTTPQueue::Transfers HTTPQueue::next(Time now, bool storebagsAlone) {
   const Lock lock(_mutex);
   if (_orders.stopping) return {};

@@ -114,7 +114,7 @@ class HTTPQueue {
   Transfers nextOf(Bulk& bulk) REQUIRES(_mutex);
   void leaves(const CurlTransfer& transfer) REQUIRES(_mutex);
 
-  // One lock guards what waits, what runs and what was ordered.
+  // One lock guards waiting and running transfers and the orders.
   mutable Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _idle;
   Transfers _storebags GUARDED_BY(_mutex);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a request keeps, and the headers of an answer. Any thread.
+// The memory of a request, and the headers of an answer. Any thread.
 #include "base/text.h"
 #include "base/value.h"
 #include "http/http_client.h"

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Decides whether a request may leave the device, and keeps account of what did. Any thread; asked before
-// each request begins.
+// Decides whether a request may leave the device, and counts and records the requests that do. Any thread;
+// called before each request begins.
 #pragma once
 
 #include <cstdint>
@@ -18,20 +18,20 @@ namespace veltrad::http {
 
 struct RequestRefusal {
   wire::Reason reason;
-  // One line, for the error of who asked.
+  // One line, for the error of the request.
   std::string text;
 };
 
-// A post of events, a datagram, a file or log data.
+// Something that leaves the device: a post of events, a datagram, a file or log data.
 struct Departure {
   enum class Kind { post, datagram, file, logData };
   Kind kind = Kind::post;
   // The whole URL, or "udp://IP:PORT".
   std::string to;
   std::uint64_t events = 1;
-  // Of its body.
+  // The size of its body.
   std::uint64_t bytes = 0;
-  // Whose it is: {"clientType", "sessionID", "client", "service"}. Null: not known.
+  // The client that sent it: {"clientType", "sessionID", "client", "service"}. Null: not known.
   std::shared_ptr<const Dictionary> client;
   // {"backend", "storebag", "entry", "removed", "hashed"}.
   Dictionary about;
@@ -39,7 +39,7 @@ struct Departure {
 
 // How a departure ended.
 struct DepartureEnd {
-  // Of the answer; 0: none.
+  // The status of the answer; 0 if there is none.
   int status = 0;
   // One line; empty: none.
   std::string error;
@@ -51,18 +51,19 @@ class RequestGate {
   virtual ~RequestGate() = default;
   // `host`: as the URL has it, without port. Nothing: it may begin.
   virtual std::optional<RequestRefusal> refusal(bool forStorebag, std::string_view host) const = 0;
-  // Asked once for each request that may begin, but for a storebag's: counts it for the owner's limits of a
-  // day, or refuses it.
+  // Called once for each request that may begin, except storebag requests: counts it for the owner's daily
+  // limits, or refuses it.
   virtual std::optional<RequestRefusal> count(const Departure& departure) = 0;
-  // Whether what leaves is recorded, so that `about` is of use.
+  // Whether departures are recorded, so that `about` is needed.
   virtual bool keepsRecords() const = 0;
-  // False: it is, and there is no room for a record just now. Nothing but storebag requests may begin then.
+  // False if departures are recorded and there is no room for a record at the moment. Then only storebag
+  // requests may begin.
   virtual bool hasRoomForRecord() const = 0;
-  // Records what begins now. The body is in `body` or, with so many bytes as the departure says, in `file`.
-  // Returns the number of the record; 0: nothing is recorded.
+  // Records a departure that begins now. The body is in `body` or, with so many bytes as the departure says,
+  // in `file`. Returns the number of the record; 0: nothing is recorded.
   virtual std::uint64_t record(const Departure& departure, std::vector<std::string> headerLines,
                                std::string_view body, std::shared_ptr<const FileDescriptor> file) = 0;
-  // One that waited, or would have begun, was refused for the owner's sake.
+  // A request that waited, or was about to begin, was refused by the owner's decision.
   virtual void refused(const Departure& departure) = 0;
   // Called once for each record.
   virtual void ended(std::uint64_t record, const DepartureEnd& end) = 0;

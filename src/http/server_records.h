@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How the servers that requests went to have answered of late. Any thread.
+// The latest results of requests, by server. Any thread.
 #pragma once
 
 #include <cstddef>
@@ -21,7 +21,7 @@ struct ServerRecord {
 
 class ServerRecords {
  public:
-  // Of this many servers; the one that was not used for the longest time makes room.
+  // The number of remembered servers; the least recently used one is replaced.
   static constexpr std::size_t kMost = 256;
 
   // `host`: "name:port", as the URL had it. `now`: seconds since 1970.

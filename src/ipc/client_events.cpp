@@ -40,7 +40,7 @@ std::optional<std::string> sendEvent(OutQueue& out, std::string_view frame) {
 bool sendRemoveUploadedFile(OutQueue& out, std::uint32_t callID) {
   Dictionary body{{key::kOperation, wire::event::kRemoveUploadedFile}};
   body.set(key::kArguments, Dictionary{{key::kCall, callID}});
-  // Has the reserve of replies, since it is as important as the reply that follows it.
+  // Uses the reserve of replies, because it is as important as the reply that follows.
   return out.sendReply(wire::makeFrame(wire::FrameKind::event, 0, std::move(body))) == OutQueue::Sent::done;
 }
 

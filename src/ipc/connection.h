@@ -44,8 +44,8 @@ class Connection {
   // connection.
   virtual void refuse(const std::string& description) = 0;
 
-  // Has the session's takeNews() called on the connection's own thread, between two calls and soon. Takes
-  // only leaf locks.
+  // Makes the connection's own thread call the session's takeNews() soon, between two calls. Takes only leaf
+  // locks.
   virtual void nudge() {}
   // Sends a frame of client_events.h. Never blocks, and takes only leaf locks. Returns why the frame was
   // dropped, if it was.

@@ -234,7 +234,7 @@ Result<Dictionary, std::string> decodeLargeCall(const wire::Frame& frame, CallMe
   }
 }
 
-// Enough of a client's own words to recognise them.
+// The beginning of a client's text, enough to recognise it.
 std::string_view shortened(std::string_view text) {
   return text.substr(0, 100);
 }

@@ -47,7 +47,7 @@ std::optional<std::string> dispatchCall(const wire::Frame& frame, wire::ClientSe
 std::optional<std::string> dispatchQuestion(const wire::Frame& frame, Observer& observer,
                                             const std::shared_ptr<OutQueue>& out, CallMemory& memory);
 
-// What is wrong with a call of this name.
+// The error text for a call of this unknown name.
 std::string unknownOperation(std::string_view name);
 
 // The dictionary in the body of a frame that is no call, or what is wrong with it.

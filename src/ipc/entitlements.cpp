@@ -125,7 +125,7 @@ bool mayHoldByRules(const Array& rules, std::string_view name, unsigned uid) {
 
 Entitlements::Entitlements(platform::FileStore& files, const std::string& path) : _file(files, path) {}
 
-// What is to be logged, once the lock was released.
+// Lines to log after the lock was released.
 struct Entitlements::Said {
   explicit Said(Entitlements& whose) : _whose(whose) {}
   Said(const Said&) = delete;

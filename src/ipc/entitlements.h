@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Who may do what: etc/veltrad/entitlements.plist or .json, reread when it changed. Any thread.
+// The entitlements of peers, from etc/veltrad/entitlements.plist or .json, which is read again after a
+// change. Any thread.
 #pragma once
 
 #include <memory>
@@ -16,7 +17,7 @@
 
 namespace veltrad::ipc {
 
-// What the rules give, for those who look for a fault.
+// The state of the rules, for diagnosis.
 struct RulesState {
   bool missing = false;               // there is no file
   std::string error;                  // why it cannot be used; empty: it can
@@ -26,17 +27,17 @@ struct RulesState {
 
 // The file is an array of rules, each {"uid": n | "gid": n | "unit": text, "entitlements": {name: value}}; a
 // rule with more than one of the three matches when all of them match, one with none never. A missing or
-// unreadable file grants nothing; an unreadable or malformed one is one error line a change. A rule of a
-// wrong type grants nothing, and one warning a change says what was expected. For a shortage the last rules
-// stand, and the file is read again at the next question.
+// unreadable file grants nothing; an unreadable or malformed file is one error for each change. A rule of a
+// wrong type grants nothing, and one warning for each change says what was expected. During a shortage the
+// last rules apply, and the file is read again at the next call.
 class Entitlements {
  public:
   // `path`: of either form.
   Entitlements(platform::FileStore& files, const std::string& path);
   // The first matching rule's value; only a boolean true is a grant, and that is the caller's to check.
   std::optional<Value> valueForEntitlement(std::string_view name, const Peer& peer);
-  // False if no rule can grant it to this user, whatever the groups and the unit of the process.
-  // How the file stands, and whether anybody is granted this. Nothing: it cannot be read just now.
+  // The state of the file, and whether any rule grants this entitlement. Absent if the file cannot be read at
+  // the moment.
   std::optional<RulesState> stateFor(std::string_view name);
   // False: no rule grants it to this user, whatever groups and unit a process of his has.
   bool mayHold(std::string_view name, unsigned uid);

@@ -99,8 +99,7 @@ std::size_t Listener::invalidate(std::chrono::steady_clock::time_point deadline)
 }
 
 void Listener::wake() {
-  const std::uint64_t one = 1;
-  [[maybe_unused]] const ssize_t written = ::write(_wakeUp.get(), &one, sizeof one);
+  ::eventfd_write(_wakeUp.get(), 1);
 }
 
 // The accepting thread, from here to reap().
@@ -109,8 +108,8 @@ void Listener::acceptLoop() {
     pollfd watched[] = {{_options.socket.listening(), POLLIN, 0}, {_wakeUp.get(), POLLIN, 0}};
     ::poll(watched, 2, -1);
     if (watched[1].revents != 0) {
-      std::uint64_t count = 0;
-      [[maybe_unused]] const ssize_t read = ::read(_wakeUp.get(), &count, sizeof count);
+      eventfd_t count = 0;
+      ::eventfd_read(_wakeUp.get(), &count);
       reap();
       Lock lock(_mutex);
       if (_stopping) return;

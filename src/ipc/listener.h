@@ -33,9 +33,9 @@ struct ListenerOptions {
   std::string entitlementsPath;
   std::size_t mostConnections = 4096;
   std::size_t mostConnectionsOfOneUser = 1024;
-  // Of them, those that root and the daemon's own user alone may have.
+  // The number of these that are reserved for root and the daemon's own user.
   std::size_t connectionsForOwner = 0;
-  // What a peer must hold to get a connection; empty: the delegate asks at each call.
+  // The entitlement that a peer needs for a connection; if empty, the delegate checks each call.
   std::string entitlement = wire::kVeltraEntitlement;
 };
 
@@ -44,8 +44,7 @@ struct ListenerOptions {
 // outlive it. resume() and invalidate() are called by the thread that made it, never by a connection's
 // thread.
 //
-// Its 13 fields are the options, what accepting needs, and the connections that it must find again when it
-// stops.
+// Its 13 fields are the options, the data for accepting, and the connections that it must end when it stops.
 class Listener {
  public:
   Listener(ListenerOptions options, ListenerDelegate& delegate);
@@ -112,7 +111,7 @@ class Listener {
   Condition _changed;
   bool _stopping GUARDED_BY(_mutex) = false;
   std::map<std::uint64_t, Client> _clients GUARDED_BY(_mutex);
-  // Those whose thread is to be joined.
+  // Clients whose threads have ended and must be joined.
   std::map<std::uint64_t, Client> _finished GUARDED_BY(_mutex);
   std::map<unsigned, std::size_t> _clientsOfUser GUARDED_BY(_mutex);
 };

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a connection to the control socket is answered by. The connection's own thread.
+// Answers the calls of a connection to the control socket. The connection's own thread.
 #pragma once
 
 #include <memory>
@@ -15,8 +15,8 @@ class PendingReply;
 class Observer {
  public:
   virtual ~Observer() = default;
-  // Answers the call, now or later; `reply` is null where none is wanted. Nothing ran if text comes back: it
-  // says in one sentence what is wrong with the call.
+  // Answers the call, now or later; `reply` is null if none is wanted. If a text is returned, nothing was
+  // run, and the text says in one sentence what is wrong with the call.
   virtual std::optional<std::string> ask(const std::string& operation, Dictionary arguments,
                                          std::shared_ptr<PendingReply> reply) = 0;
 };

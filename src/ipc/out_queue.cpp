@@ -18,7 +18,7 @@ static_assert(kOutQueueBound == wire::kFrameBodyLimit + wire::kFrameHeaderBytes)
 
 namespace {
 
-// Limits the reads from a client that goes on writing while its connection is closed.
+// Limits the reads from a client that keeps writing while its connection is closed.
 constexpr int kMostDrainingReads = 1024;
 // A growing buffer takes up to twice the bytes that wait.
 constexpr std::size_t kBytesOfByte = 2;
@@ -161,15 +161,12 @@ void OutQueue::stopReading() {
 }
 
 void OutQueue::wake() {
-  if (!_wakeUp.isOpen()) return;
-  const std::uint64_t one = 1;
-  // It only fails if a wake-up is pending.
-  [[maybe_unused]] const ssize_t written = ::write(_wakeUp.get(), &one, sizeof one);
+  if (_wakeUp.isOpen()) ::eventfd_write(_wakeUp.get(), 1);  // fails only if a wake-up is pending
 }
 
 void OutQueue::drainWakeUp() {
-  std::uint64_t count = 0;
-  [[maybe_unused]] const ssize_t read = ::read(_readWakeUp, &count, sizeof count);
+  eventfd_t count = 0;
+  ::eventfd_read(_readWakeUp, &count);
 }
 
 // Nothing more can be written.

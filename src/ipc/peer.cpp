@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the kernel about peers.
+// Gets the credentials, groups and unit of a peer from the kernel.
 #include "ipc/peer.h"
 
 #include <fcntl.h>

@@ -26,7 +26,7 @@ struct Peer {
 Result<Peer, std::string> credentialsOfSocket(int socket);
 // All fields. Fails also if a shortage prevents the look-up of the unit.
 Result<Peer, std::string> peerOfSocket(int socket);
-// Root, and the user that the daemon runs as, who may read and change its files anyway.
+// True for root and the daemon's own user, which may read and change its files anyway.
 bool isOwner(unsigned uid);
 // False only on kernels that cannot say which unit a peer belongs to.
 bool kernelTellsUnits();

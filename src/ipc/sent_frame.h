@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The reply to a message, as it is kept for the next one.
+// Caches the reply to a message for the next message.
 #pragma once
 
 #include <cstdint>
@@ -10,11 +10,11 @@
 
 namespace veltrad::ipc {
 
-// Most messages of a session have the outcomes of the one before, so that their replies differ in the call ID
-// alone; the last frame is kept, which makes such a reply cost a comparison. The owner guards it.
+// Most messages of a session have the same outcomes as the one before, so their replies differ only in the
+// call ID. The last frame is kept, so that such a reply costs a comparison. The owner guards it.
 class SentFrame {
  public:
-  // Of a reply without a text; valid until the next call.
+  // The frame of a reply without a text; valid until the next call.
   const std::string& of(std::uint32_t callID, const wire::Outcomes& outcomes);
 
   static Dictionary resultsOf(const wire::Outcomes& outcomes);

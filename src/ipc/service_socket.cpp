@@ -33,7 +33,7 @@ Result<FileDescriptor, std::string> takeLock(const std::string& path) {
       refusal.description)};
 }
 
-// Absent: nothing stands at the path any more. Only the holder of the lock calls it.
+// Absent if nothing is at the path now. Only the holder of the lock may call it.
 std::optional<std::string> removeStale(const std::string& path) {
   struct stat found {};
   if (::lstat(path.c_str(), &found) != 0) {

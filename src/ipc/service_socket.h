@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The sockets on which the daemon is reached, and the lock that says which process is the daemon. Made and
-// used by one thread at a time.
+// The daemon's listening sockets, and the lock that ensures that there is only one daemon. Made and used by
+// one thread at a time.
 #pragma once
 
 #include <sys/types.h>

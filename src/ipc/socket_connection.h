@@ -24,7 +24,7 @@ namespace veltrad::ipc {
 // call stop(), nudge() and sendEvent(). Entitlements, lent files and counters must outlive it. A session and
 // its connection hold each other until run() returns.
 //
-// Its 20 fields are the services that a call needs, what the delegate has set, and the state of the
+// Its 20 fields are the services that a call needs, the delegate's settings, and the state of the
 // conversation.
 class SocketConnection final : public Connection, public std::enable_shared_from_this<SocketConnection> {
  public:

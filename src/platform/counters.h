@@ -11,14 +11,14 @@
 
 namespace veltrad::platform {
 
-// What has left the device on a day of UTC.
+// The amounts that left the device on a day (UTC).
 struct DayAccount {
   std::int64_t day = 0;  // since 1970
   std::uint64_t events = 0;
   std::uint64_t bytes = 0;
 };
 
-// What a process has counted. It may lie in a file that outlives the process (counts_record.h).
+// The counts of a process, possibly in a file that outlives the process (counts_record.h).
 struct Counts {
   // Events that a back end has taken in. Each is later counted under one reason, as posted, lost or dropped.
   std::atomic<std::uint64_t> eventsTaken{0};
@@ -43,10 +43,10 @@ class Counters {
   std::uint64_t value(wire::Reason reason) const {
     return _counts->ofReason[static_cast<std::size_t>(reason)].load(std::memory_order_relaxed);
   }
-  // Counts there from now on, and goes on from what stands there, which must outlive it. To be called before
-  // anything is counted and before another thread exists.
+  // Makes `counts`, which must outlive this, the place of the counters, and continues from its values. To be
+  // called before anything is counted and before another thread exists.
   void countIn(Counts& counts) { _counts = &counts; }
-  // Of all counts. They only grow, so equal totals mean equal counts.
+  // The sum of all counts. They only grow, so equal sums mean equal counts.
   std::uint64_t total() const;
   // `startedAt` is in seconds since 1970.
   std::string json(double startedAt) const;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Maps the file of counts, and works out what the process before has lost.
+// Maps the file of counts, and computes the losses of the previous process.
 #include "platform/counts_record.h"
 
 #include <fcntl.h>
@@ -20,7 +20,7 @@ namespace veltrad::platform {
 
 namespace {
 
-// Differs between programs whose tables of reasons do, so that none reads numbers of another.
+// Differs between programs with different tables of reasons, so that none reads the numbers of another.
 constexpr std::uint64_t fingerprint() {
   std::uint64_t hash = 0xcbf29ce484222325;
   for (const wire::ReasonEntry& entry : wire::kReasons) {
@@ -37,7 +37,7 @@ bool saysLoss(const wire::ReasonEntry& entry) {
   return what.starts_with(" lost") || what.starts_with(" dropped");
 }
 
-// Whether the count is of events that a back end has taken in, and ends their road.
+// Whether the reason settles an event that a back end has accepted.
 bool settles(wire::Reason reason) {
   switch (reason) {
     case wire::Reason::backend_disabled:  // not taken in
@@ -73,7 +73,7 @@ std::string failure(const std::string& path, int error) {
 
 }  // namespace
 
-// As it stands in the file, in numbers of this machine.
+// The content of the file, in the machine's byte order.
 struct CountsRecord::Block {
   std::uint64_t table = fingerprint();
   std::int64_t pid = ::getpid();
@@ -99,7 +99,7 @@ Result<CountsRecord, std::string> CountsRecord::open(const std::string& path, Fi
   fresh.counts.ofReason[static_cast<std::size_t>(wire::Reason::daemon_ended)] =
       readable ? lostBy(*record._block, files, countersPath) : 0;
   if (readable) fresh.counts.day = record._block->counts.day;
-  // At once, as far as a kill is concerned: the old numbers stand there until the new ones do.
+  // One write, so that a kill leaves either the old or the new numbers.
   if (::pwrite(file.get(), static_cast<const void*>(&fresh), sizeof fresh, 0) != sizeof fresh) {
     return Failure{failure(path, errno)};
   }

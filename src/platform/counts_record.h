@@ -12,14 +12,14 @@ namespace veltrad::platform {
 
 class FileStore;
 
-// A process that is killed can settle nothing any more: events in batches and posts under way are lost, and
-// what it has counted since it last wrote its counters file is known to nobody. The next one counts both as
-// lost ("event lost: the daemon before this one ended"). Used by the thread that made it.
+// When a process is killed, the events in its batches and open posts are lost, and so are its counts since it
+// last wrote its counters file. The next process counts both as lost ("event lost: the daemon before this one
+// ended"). Used by the thread that made it.
 class CountsRecord {
  public:
-  // Opens the file (mode 0600), which belongs to whoever holds the daemon's lock, and maps it. It then holds
-  // the counts of this process, which begin with what the one before has lost and with its account of the
-  // day. `countersPath`: the counters file, as that one left it. Fails if the file cannot be made or mapped.
+  // Opens the file (mode 0600) and maps it; the caller must hold the daemon's lock. The file then holds the
+  // counts of this process, which begin with the losses of the previous one and its account of the day.
+  // `countersPath`: the counters file, as that one left it. Fails if the file cannot be made or mapped.
   static Result<CountsRecord, std::string> open(const std::string& path, FileStore& files,
                                                 const std::string& countersPath, double startedAt);
   CountsRecord(CountsRecord&& other) noexcept;
@@ -28,7 +28,8 @@ class CountsRecord {
   ~CountsRecord();
 
   Counts& counts();
-  // The counters file shows all counts. Events that are not settled are still the next process's to count.
+  // To be called when the counters file shows all counts. The next process still counts events that are not
+  // settled.
   void told();
 
  private:

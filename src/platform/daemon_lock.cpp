@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// One flock on a file that stays.
+// Uses flock() on a file that is never removed.
 #include "platform/daemon_lock.h"
 
 #include <fcntl.h>
@@ -58,7 +58,7 @@ Result<FileDescriptor, LockRefusal> takeDaemonLock(const std::string& path, Owne
     if (errno != EWOULDBLOCK) return outOfReach(path, errno);
     return Failure{LockRefusal{true, fmt::format("{} holds {}", holderOf(lock.get()), path)}};
   }
-  // Who holds it is for people; the lock holds without it.
+  // The content is only information; the lock works without it.
   const std::string holder = fmt::format("{}\n", ::getpid());
   if (::ftruncate(lock.get(), 0) == 0) {
     [[maybe_unused]] const ssize_t written = ::pwrite(lock.get(), holder.data(), holder.size(), 0);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The lock that says that a daemon runs under a root. One thread at a time.
+// The lock file that allows one daemon for each root. One thread at a time.
 #pragma once
 
 #include <string>

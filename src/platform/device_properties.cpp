@@ -37,7 +37,7 @@ MachineProperties::MachineProperties(FileStore& files, const std::string& device
 
 DeviceProperty MachineProperties::value(std::string_view key) {
   const auto list = configured();
-  // The machine's value does not stand in: it may differ.
+  // The machine's value is not used instead, because it may differ.
   if (!list) return Failure{list.error()};
   const std::string* text = list.value().string(key);
   if (!text) return key == "UniqueDeviceID" ? sinceReset(fromMachine(key)) : fromMachine(key);

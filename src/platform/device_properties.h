@@ -37,13 +37,13 @@ class DeviceProperties {
 // machine says: os-release, DMI or device tree, chassis. "UniqueDeviceID" is 40 hexadecimal digits derived
 // one-way from the machine id. The machine's files are always the host's, not under the root. An unreadable
 // or malformed one is one error line a change, and as if it were not there. The machine's files are read at
-// each question; what cannot be read for a shortage is as it was when it last could be.
+// each question; what cannot be read because of a shortage is as it was when it last could be.
 class MachineProperties final : public DeviceProperties {
  public:
   // `devicePath`: of either form.
   MachineProperties(FileStore& files, const std::string& devicePath);
-  // From now on, "UniqueDeviceID" of the machine is derived from the secret as well, once the preference
-  // kIdentifiersReset is set. Before other threads ask; the arguments outlive it.
+  // From now on, "UniqueDeviceID" of the machine is also derived from the secret if the preference
+  // kIdentifiersReset is set. To be called before other threads ask; the arguments must outlive it.
   void heedReset(Preferences& preferences, DeviceSecret& secret);
   DeviceProperty value(std::string_view key) override;
   // Whether the configured list has the key. False also during a shortage.
@@ -53,7 +53,7 @@ class MachineProperties final : public DeviceProperties {
 
  private:
   DeviceProperty fromMachine(std::string_view key);
-  // The identifier that stands for the machine's since the owner has reset it.
+  // The identifier that replaces the machine's after a reset by the owner.
   DeviceProperty sinceReset(const DeviceProperty& machines);
   Result<Dictionary, FileFailure> configured();
   static void complain(const LocalContent& content);
@@ -63,7 +63,7 @@ class MachineProperties final : public DeviceProperties {
   DeviceSecret* _secret = nullptr;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   LocalSettings _file GUARDED_BY(_mutex);
-  // As last read; what stands in during a shortage.
+  // The content as last read, used during a shortage.
   std::shared_ptr<const LocalContent> _content GUARDED_BY(_mutex);  // null before the first reading
   Dictionary _list GUARDED_BY(_mutex);
   std::map<std::string, std::optional<std::string>, std::less<>> _lastFacts GUARDED_BY(_mutex);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The secret of this device, which nothing that leaves it reveals. Any thread.
+// The secret of this device, which never leaves it. Any thread.
 #pragma once
 
 #include <optional>
@@ -11,17 +11,16 @@
 
 namespace veltrad::platform {
 
-// 32 random bytes in a file of mode 0600, made at the first use. A file that cannot be written, or that is
-// not of that size and therefore not this one's, is one warning; then a secret serves that lasts as long as
-// this object.
+// 32 random bytes in a file of mode 0600, made at the first use. If the file cannot be written, or has
+// another size, one warning is logged, and the secret lasts only as long as this object.
 class DeviceSecret {
  public:
   static constexpr std::size_t kBytes = 32;
 
-  // The store outlives it.
+  // The store must outlive it.
   DeviceSecret(FileStore& files, std::string path) : _files(files), _path(std::move(path)) {}
 
-  // Nothing: for a shortage nobody can say what is stored, so nothing was made.
+  // Nothing: because of a shortage nobody can say what is stored, so nothing was made.
   std::optional<std::string> bytes();
   // Makes and stores another secret. If that fails, the one before stays.
   Result<Done, FileFailure> renew();

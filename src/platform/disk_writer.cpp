@@ -18,11 +18,13 @@ DiskWriter::Queue::~Queue() {
 }
 
 bool DiskWriter::Queue::run(Job job, std::chrono::steady_clock::time_point deadline) {
-  // The job's, because it may outlive this call. Its end is noticed if it throws, too.
-  const auto done = std::make_shared<std::promise<void>>();
+  const auto done = std::make_shared<std::promise<void>>();  // the job's, because it may outlive this call
   const auto ran = done->get_future();
   const auto whole = [job = std::move(job), done] {
-    job();
+    try {
+      job();
+    } catch (const std::bad_alloc&) {  // what it left is its owner's
+    }
     done->set_value();
   };
   return put(whole, 1) == Put::taken && ran.wait_until(deadline) == std::future_status::ready;

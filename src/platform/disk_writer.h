@@ -36,7 +36,7 @@ class DiskWriter {
   using Lanes = std::list<Lane>;
 
  public:
-  // The jobs of one owner, who counts those that are not taken.
+  // The jobs of one owner. The owner counts jobs that were not accepted.
   class Queue {
    public:
     enum class Put { taken, full, noThread };
@@ -49,7 +49,7 @@ class DiskWriter {
 
     // Never waits. full: too many bytes wait before it. noThread: none can be started for now.
     Put put(Job job, std::size_t bytes) { return _writer.put(_lane, std::move(job), bytes); }
-    // Puts a job and waits until it has run, or has failed for want of memory. False if it is not taken, or
+    // Puts a job and waits until it has run, or has failed for lack of memory. False if it is not taken, or
     // `deadline` passed first: then it may still run.
     bool run(Job job, std::chrono::steady_clock::time_point deadline);
 

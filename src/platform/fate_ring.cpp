@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Writes, finds and copies entries. The first word of a slot is twice the position of the entry that stands
-// there, and one more while it is being written.
+// Writes, finds and copies entries. The first word of a slot is twice the position of its entry, plus one
+// while the entry is being written.
 #include "platform/fate_ring.h"
 
 #include <algorithm>

@@ -1,7 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The record of fates: what was decided for messages and what became of them, in a ring of fixed size. Any
-// thread, without locks, and nothing is allocated after construction, but for contents while somebody
-// watches.
+// The record of fates: the decisions on messages and their results, in a ring of fixed size. Any thread,
+// without locks, and nothing is allocated after construction, except for contents while somebody watches.
 #pragma once
 
 #include <atomic>
@@ -19,9 +18,9 @@
 
 namespace veltrad::platform {
 
-// Entries stand in the order in which they were written; the oldest are overwritten. A position counts
-// entries from 1 and is never used again. An entry refers to others, such as texts, only if they are at most
-// refresh() older, so that it knows them as long as it stands, but for the oldest few entries of the ring.
+// Entries are in the order of writing; the oldest are overwritten. A position counts entries from 1 and is
+// never used again. An entry refers to others, such as texts, only if they are at most refresh() older, so
+// that they exist as long as the entry, except for the oldest few entries of the ring.
 class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its counters have a cache line alone
  public:
   static constexpr std::size_t kLeastBytes = 64u << 10;
@@ -47,8 +46,8 @@ class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its count
     put(position, wire::wordsOf(entry));
     return position;
   }
-  // The position of the text, which is written anew unless it stands in the ring and is fresh. What is longer
-  // than kLongestText is cut.
+  // The position of the text, which is written again unless a fresh copy is in the ring. Texts longer than
+  // kLongestText are truncated.
   std::uint64_t intern(std::string_view text);
   static wire::FateRef refTo(std::uint64_t position) { return static_cast<wire::FateRef>(position); }
   // Whether a new entry may refer to the one at this position.
@@ -56,7 +55,7 @@ class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its count
     return position != 0 && _next.load(std::memory_order_relaxed) - position <= _refresh;
   }
 
-  // For readers, who may fall behind.
+  // A part of the ring for a reader, which may fall behind the writers.
   struct Copy {
     std::string entries;     // for each its position and its words: 8 numbers of 8 bytes in the host's order
     std::uint64_t next = 0;  // where to go on
@@ -69,15 +68,15 @@ class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its count
   std::uint64_t next() const { return _next.load(std::memory_order_acquire); }
   std::size_t size() const { return _size; }
   std::size_t refresh() const { return _refresh; }
-  // What the messages hold, which is not in the record.
+  // The contents of messages, which are not in the record.
   WatchedContents& contents() { return _contents; }
 
  private:
-  // Of the table that finds texts again.
+  // The associativity of the table that finds texts.
   static constexpr std::size_t kWays = 4;
   static constexpr std::size_t kBuckets = 128;
   static constexpr std::size_t kTableBytes = kWays * kBuckets * sizeof(std::uint64_t);
-  // A word that says which entry stands there, and the entry.
+  // A word with the position of the entry, and the entry.
   static constexpr std::size_t kSlotWords = 1 + wire::kFateWords;
   static constexpr std::size_t kSlotBytes = kSlotWords * sizeof(std::uint64_t);
 
@@ -87,7 +86,7 @@ class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its count
 
   std::uint64_t claim(std::size_t entries) { return _next.fetch_add(entries, std::memory_order_relaxed); }
   void put(std::uint64_t position, const wire::FateWords& words);
-  // False if another entry stands there.
+  // False if the slot holds another entry.
   bool read(std::uint64_t position, wire::FateWords& words) const;
   bool holds(std::uint64_t position, const wire::TextEntry& first, std::string_view rest) const;
   std::span<std::uint64_t> slot(std::uint64_t position) const {
@@ -97,7 +96,7 @@ class FateRing {  // NOLINT(clang-analyzer-optin.performance.Padding): its count
   const Clock& _clock;
   const std::size_t _size;  // in entries
   const std::size_t _refresh;
-  // All zeros, which the system gives as they are first used.
+  // Zeroed memory, which the system allocates at the first use of each page.
   const std::unique_ptr<std::uint64_t[], Free> _memory;
   std::uint64_t* const _slots;
   std::uint64_t* const _texts;

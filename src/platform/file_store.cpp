@@ -36,7 +36,7 @@ FileFailure tooLarge(const std::string& path, std::size_t most) {
   return {FileFailure::Kind::tooLarge, path + ": larger than " + std::to_string(most) + " bytes"};
 }
 
-// What a new file gets; without an owner it stays this process's.
+// The mode and owner of a new file; without an owner it belongs to this process.
 struct Belonging {
   unsigned mode;
   std::optional<std::pair<uid_t, gid_t>> owner;

@@ -37,8 +37,8 @@ class FileStore {
   virtual Result<Done, FileFailure> rename(const std::string& from, const std::string& to) = 0;
   // Removes a file; one that is not there is removed already.
   virtual Result<Done, FileFailure> unlink(const std::string& path) = 0;
-  // Changes when the file is written or replaced; absent while there is no such file. Fails for a shortage
-  // alone.
+  // Changes when the file is written or replaced; absent while there is no such file. Fails only because of a
+  // shortage.
   virtual Result<FileStamp, FileFailure> stamp(const std::string& path) = 0;
 };
 

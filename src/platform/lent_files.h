@@ -23,7 +23,8 @@ class LentFile {
   int descriptor() const { return _file.get(); }
   // To be checked before the descriptor is used.
   wire::FileOrigin origin() const { return wire::FileOrigin::of(_file.get(), _lender); }
-  // Asks the lender to remove its file, which it may refuse; does not wait. False if it cannot be asked.
+  // Asks the client to remove its file, which the client may refuse; does not wait. False if the client
+  // cannot be asked.
   [[nodiscard]] bool askForRemoval() const { return _askForRemoval(); }
 
  private:

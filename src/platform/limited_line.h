@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Limits the rate of a log line that others can cause at will. Any thread.
+// Limits the rate of a log line that clients or servers can trigger. Any thread.
 #pragma once
 
 #include <chrono>
@@ -18,7 +18,7 @@ class LimitedLine {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // What is counted, in the plural: "copies", "posts".
+  // The plural of the counted things: "copies", "posts".
   explicit LimitedLine(std::string_view counted) : _counted(counted) {}
 
   // The line to log now; absent if the occurrence is only counted.

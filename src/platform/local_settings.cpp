@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which form of a settings file counts, and what it says. Its owner locks.
+// Chooses the form of a settings file and parses it. Its owner locks.
 #include "platform/local_settings.h"
 
 #include <fmt/format.h>

@@ -13,7 +13,7 @@
 
 namespace veltrad::platform {
 
-// What such a file said when it was last read. Immutable.
+// The content of such a file when it was last read. Immutable.
 struct LocalContent {
   enum class Kind { absent, good, broken };
   Kind kind = Kind::absent;
@@ -29,16 +29,16 @@ struct LocalContent {
   std::string placeOf(const std::vector<std::string>& keys) const;
 };
 
-// NAME.json and NAME.plist say the same things; where both are there, the JSON counts. JSON has comments,
-// {"$date": seconds since 1970} and {"$data": "base64"}.
+// NAME.json and NAME.plist are two forms of the same file; if both exist, the JSON is used. JSON has
+// comments, {"$date": seconds since 1970} and {"$data": "base64"}.
 class LocalSettings {
  public:
-  // `path`: of either form. The store outlives it.
+  // `path`: of either form. The store must outlive it.
   LocalSettings(FileStore& files, const std::string& path);
 
-  // What the file says now: one object until that changes, so that its owner acts on it, and logs its error
-  // and warning, once. Reads when a file has changed, and costs two calls of the system otherwise. A failure
-  // is a shortage, and the file is read at the next call, as it is if std::bad_alloc is thrown.
+  // The current content: the same object until the file changes, so that the owner handles it, and logs its
+  // error and warning, once. Reads the file only after a change; otherwise it makes two system calls. A
+  // failure is a shortage, and the file is read at the next call, as it is if std::bad_alloc is thrown.
   Result<std::shared_ptr<const LocalContent>, FileFailure> content();
   // The next content() reads, whether a file has changed or not.
   void readAgain() { _stamps.reset(); }

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Memory accounts: their sums, waiting for memory, and dropping what may be dropped.
+// Memory accounts: their sums, waiting for memory, and eviction.
 #include "platform/memory_budget.h"
 
 #include <chrono>

@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where a file is on disk, also for a process that writes as root into a directory of another user. Any
-// thread.
+// Opens a file's directory safely, also for root in a directory of another user. Any thread.
 #pragma once
 
 #include <optional>
@@ -12,8 +11,8 @@
 
 namespace veltrad::platform {
 
-// Whose what is written is. inherited: for root in a directory of the daemon's user. What is written gets the
-// owner and mode of the file that it replaces, and what is new the owner of its directory, so that the daemon
+// The owner of written files. inherited: for root in a directory of the daemon's user. A written file gets
+// the owner and mode of the file that it replaces, a new file the owner of its directory, so that the daemon
 // can use it. A symbolic link is an error (ELOOP), except where root or this process's user alone can have
 // made it, so that the daemon's user cannot lead root to other files.
 enum class Ownership { own, inherited };

@@ -18,7 +18,7 @@
 namespace veltrad::platform {
 
 inline constexpr std::string_view kVeltraPreferenceDomain = "com.florn.veltra";
-// When the texts that were made were made: a dictionary of dates.
+// The dates at which generated texts were made, a dictionary.
 inline constexpr const char* kMadeAt = "madeAt";
 
 class Preferences {

@@ -7,8 +7,7 @@
 
 namespace veltrad::platform {
 
-// Opens /dev/null for each closed descriptor from 0 to 2; otherwise the next file that is opened would get
-// its number.
+// Opens /dev/null for each closed descriptor from 0 to 2, because the next opened file would get that number.
 void openStandardDescriptors();
 
 // Removes all other environment variables, because libraries read theirs at any time and some load code.

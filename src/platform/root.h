@@ -21,10 +21,10 @@ class Root {
 
   std::string runDirectory() const { return path("run/veltrad"); }
   std::string socketPath() const { return wire::socketPathUnder(_directory); }
-  // For programs that look after the device.
+  // The socket for administration programs.
   std::string controlSocketPath() const { return wire::controlSocketPathUnder(_directory); }
   std::string lockPath() const { return path("run/veltrad/lock"); }
-  // What the counters file shows, for the next daemon if this one is killed.
+  // The counts of this daemon, for the next one if this one is killed.
   std::string countsPath() const { return path("run/veltrad/counts"); }
   std::string countersPath() const { return path("run/veltrad/counters.json"); }
   std::string stateDirectory() const { return path("var/lib/veltrad"); }

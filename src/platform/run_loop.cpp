@@ -42,7 +42,7 @@ struct Signals {
   bool hangUp = false;
 };
 
-// Those that have come.
+// Reads the pending signals.
 Signals signalsIn(int descriptor) {
   Signals come;
   signalfd_siginfo information{};

@@ -25,7 +25,7 @@ SandboxProfile veltradSandboxProfile(const Root& root);
 
 struct SandboxState {
   bool inForce;
-  // Says what is in force.
+  // A log line that describes the sandbox in force.
   std::string line;
 };
 // Enters the sandbox. Missing paths, and rights that the kernel does not know, are left out. Without Landlock

@@ -15,7 +15,7 @@ namespace veltrad::platform {
 
 namespace {
 
-// Of a Unix socket: its path, or what follows the zero byte of an abstract one.
+// The path of a Unix socket, or the name of an abstract one.
 std::string nameOf(int socket) {
   sockaddr_un address{};
   socklen_t size = sizeof address;

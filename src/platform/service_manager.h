@@ -10,8 +10,8 @@
 
 namespace veltrad::platform {
 
-// Descriptors, told apart by the names that they are bound to: one that ends in "control.sock" is the control
-// socket. Each that did not come is absent.
+// Descriptors, distinguished by their paths: one that ends in "control.sock" is the control socket. A
+// descriptor that was not passed is absent.
 struct HandedOver {
   std::optional<int> service;
   std::optional<int> control;

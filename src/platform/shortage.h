@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which errno values are shortages.
+// The errno values that count as shortages.
 #pragma once
 
 #include <cerrno>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A file that shows a state of the process, rewritten when the state has changed. Main thread.
+// A file with a state of the process, rewritten after the state has changed. Main thread.
 #pragma once
 
 #include <array>
@@ -18,7 +18,7 @@ namespace veltrad::platform {
 
 class FileStore;
 
-// The disk writer replaces the file (mode 0644). What the constructor takes must outlive it.
+// The disk writer replaces the file (mode 0644). The constructor's arguments must outlive it.
 class StateFile {
  public:
   // Numbers that differ where the state differs; unused ones are 0.
@@ -27,7 +27,7 @@ class StateFile {
     const char* name;  // as its line in the log begins: "The counters"
     // Both are called on the disk writer's thread, the first also on the main thread.
     std::function<Version()> version;
-    // What the file holds.
+    // The content for the file.
     std::function<std::string()> text;
     // At this version there is nothing to say yet, and no file.
     std::optional<Version> silent = {};

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Keeps what messages hold as property lists, whose size is known.
+// Keeps contents as property lists, because their size is known.
 #include "platform/watched_contents.h"
 
 #include <algorithm>
@@ -10,7 +10,7 @@
 namespace veltrad::platform {
 
 namespace {
-// Of a piece in memory, and in an answer.
+// The size of a piece in memory and in an answer.
 std::size_t sizeOf(const WatchedContents::Piece& piece) {
   constexpr std::size_t kBeside = 96;
   return piece.contents.capacity() + kBeside;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What messages hold, kept only while somebody watches. Any thread.
+// Keeps the contents of messages while somebody watches them. Any thread.
 #pragma once
 
 #include <atomic>
@@ -15,15 +15,15 @@
 
 namespace veltrad::platform {
 
-// All who watch read the same. The newest that find room are kept; a position counts them from 1 and is never
-// used again.
+// All watchers read the same queue. The newest contents that fit are kept; positions count from 1 and are
+// never reused.
 class WatchedContents {
  public:
   static constexpr std::size_t kMostBytes = 4u << 20;
-  // What is larger is not kept. One, and what goes with it, fits a frame.
+  // Larger contents are not kept. One of this size fits a frame with its fields.
   static constexpr std::size_t kMostOfOne = (1u << 20) - (16u << 10);
 
-  // Somebody watches while it lives.
+  // Contents are kept while a Watch exists.
   class Watch {
    public:
     explicit Watch(WatchedContents& contents) : _contents(contents) {}
@@ -36,9 +36,9 @@ class WatchedContents {
   };
   std::unique_ptr<Watch> watch();
 
-  // Called before readers learn of the message. Without anybody who watches it costs a comparison. Either may
-  // be null. Nothing in it may be what the owner of the device keeps back. For want of memory nothing is
-  // kept, and readers count the message among those whose contents are lost.
+  // To be called before readers can see the message. Costs one comparison without a watcher. Either may be
+  // null. Must not contain fields that the owner of the device withholds. For lack of memory nothing is kept,
+  // and readers count the message among those whose contents are lost.
   void keep(std::uint64_t message, const Dictionary* payload, const Dictionary* userInfo) {
     if (_watching.load(std::memory_order_relaxed) > 0) tryToPut(message, payload, userInfo);
   }

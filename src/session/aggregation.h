@@ -19,7 +19,7 @@ namespace veltrad::session {
 struct CopySent {
   // The session aggregates, so no other session gets the copy.
   bool taken = false;
-  // Says that the copy was lost. Logged after all locks are released.
+  // A log line if the copy was lost. Logged after all locks are released.
   std::optional<std::string> line;
   // The session whose client gets it; empty: it was lost.
   std::string to = {};
@@ -38,7 +38,7 @@ class Aggregation {
   CopySent sendToAggregator(std::string_view copy, const std::string& session);
   // Stops aggregating. If it was active, tells the client that no more copies follow.
   [[nodiscard]] std::optional<std::string> shutdownSessionAggregation(std::uint32_t sessionID);
-  // Has the session take news, on its own thread.
+  // Makes the session's own thread call takeNews().
   void nudge();
   // Releases the connection.
   [[nodiscard]] std::optional<std::string> end();

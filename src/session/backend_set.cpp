@@ -16,6 +16,28 @@ backends::VeltraBackend* named(const BackendSet* set, const std::string& name) {
   const auto at = set ? set->find(name) : BackendSet::const_iterator();
   return set && at != set->end() ? at->second.get() : nullptr;
 }
+
+// Completes the facts that the back ends of one session share.
+void complete(backends::SessionFacts& facts, const BackendMaking& making,
+              const config::StorebagOrigin& origin, const Dictionary& sessionInfo) {
+  facts.startTimeStamp = making.before && !making.before->empty()
+                             ? making.before->begin()->second->facts()->startTimeStamp
+                             : platform::timevalToSeconds(making.clock.now());
+  facts.device.productVersion = making.device.deviceProductVersion();
+  facts.device.buildVersion = making.device.deviceBuildVersion();
+  facts.device.hardwareType = making.device.deviceProductType();
+  facts.device.isInternal = making.device.isInternalBuild();
+  facts.selfVersion = backends::SelfVersion::of(making.library.packageVersion());
+  facts.sessionID = sessionInfo.uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
+  facts.compType = sessionInfo.int32(wire::kVeltraSessionInfoClientType).value_or(0);
+  facts.clientVersion = sessionInfo.uint16(wire::kVeltraSessionInfoClientVersion).value_or(0);
+  facts.requireUserInfo = sessionInfo.boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
+  facts.batchEvents = sessionInfo.boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false);
+  facts.account = making.account;
+  facts.client = backends::clientOf(facts);
+  facts.storebag = std::make_shared<const Dictionary>(
+      Dictionary{{"name", origin.name}, {"version", orNull(origin.version)}, {"section", origin.section}});
+}
 }  // namespace
 
 std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
@@ -30,33 +52,15 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
     logError("createBackends: Attempted to create backends with nil session info");
     return nullptr;
   }
-  facts.startTimeStamp = making.before && !making.before->empty()
-                             ? making.before->begin()->second->facts()->startTimeStamp
-                             : platform::timevalToSeconds(making.clock.now());
-  facts.device.productVersion = making.device.deviceProductVersion();
-  facts.device.buildVersion = making.device.deviceBuildVersion();
-  facts.device.hardwareType = making.device.deviceProductType();
   const auto productFamily = making.device.deviceName();
-  facts.device.isInternal = making.device.isInternalBuild();
-  facts.selfVersion = backends::SelfVersion::of(making.library.packageVersion());
-  facts.sessionID = sessionInfo->uint32(wire::kVeltraSessionInfoSessionID).value_or(0);
-  facts.compType = sessionInfo->int32(wire::kVeltraSessionInfoClientType).value_or(0);
-  facts.clientVersion = sessionInfo->uint16(wire::kVeltraSessionInfoClientVersion).value_or(0);
-  facts.requireUserInfo = sessionInfo->boolean(wire::kVeltraSessionInfoRequireUserInfo).value_or(false);
-  facts.batchEvents = sessionInfo->boolean(wire::kVeltraSessionInfoBatchEvent).value_or(false);
-  facts.account = making.account;
-  facts.client = backends::clientOf(facts);
-  const config::StorebagOrigin& origin = storebag->origin;
-  facts.storebag = std::make_shared<const Dictionary>(
-      Dictionary{{"name", origin.name}, {"version", orNull(origin.version)}, {"section", origin.section}});
-
+  complete(facts, making, storebag->origin, *sessionInfo);
   const auto shared = std::make_shared<const backends::SessionFacts>(std::move(facts));
   auto made = std::make_shared<BackendSet>();
   const auto notMade = [&making](const std::string& name, wire::Reason why) {
     if (making.notMade) making.notMade->emplace_back(name, why);
   };
   for (const auto& [name, profile] : storebag->backends) {
-    if (!making.word.policy->makes(name)) {
+    if (!making.decision.policy->makes(name)) {
       making.counters.count(wire::Reason::policy_backends);
       notMade(name, wire::Reason::policy_backends);
       continue;
@@ -70,7 +74,7 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
       continue;
     }
     if (backend->hostsAreFixed() &&
-        making.word.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
+        making.decision.refusalFor(name, backend->hosts()) == wire::Reason::policy_hosts) {
       making.counters.count(wire::Reason::policy_hosts);
       notMade(name, wire::Reason::policy_hosts);
       backend->cleanup();
@@ -92,9 +96,9 @@ void cleanUp(const BackendSet* backends) {
   for (const auto& [name, backend] : *backends) backend->cleanup();
 }
 
-void forbidByWord(const BackendSet& backends, const config::OwnersWord& word) {
+void applyProhibitions(const BackendSet& backends, const config::OwnerDecision& decision) {
   for (const auto& [name, backend] : backends) {
-    backend->setProhibition(word.refusalFor(name, backend->hosts()));
+    backend->setProhibition(decision.refusalFor(name, backend->hosts()));
   }
 }
 

@@ -34,12 +34,12 @@ struct BackendMaking {
   const support::Veltra& library;
   platform::Clock& clock;
   platform::Counters& counters;
-  const config::OwnersWord& word;
+  const config::OwnerDecision& decision;
   std::shared_ptr<platform::MemoryAccount> account = nullptr;
   bool oneShot = false;
-  // Gets those that were not made, unless it is null.
+  // Receives the back ends that were not made, unless it is null.
   NotMade* notMade = nullptr;
-  // Those that the new ones take over from, by name; null: none.
+  // The previous back ends, from which the new ones take over by name; may be null.
   const BackendSet* before = nullptr;
 };
 
@@ -51,14 +51,14 @@ std::shared_ptr<const BackendSet> createBackends(const BackendMaking& making,
                                                  const config::StorebagSection* storebag,
                                                  const Dictionary* sessionInfo, backends::SessionFacts facts);
 
-// Has each decide on its state. The set may be null, here and below.
+// Makes each back end decide on its state. The set may be null, here and below.
 void updateStates(const BackendSet* backends);
 
 // Called before the session releases the back ends.
 void cleanUp(const BackendSet* backends);
 
-// Tells the back ends what the owner's word is now. The session's thread.
-void forbidByWord(const BackendSet& backends, const config::OwnersWord& word);
+// Applies the owner's current decision to the back ends. The session's thread.
+void applyProhibitions(const BackendSet& backends, const config::OwnerDecision& decision);
 
 // The names of those that are reporting or held.
 std::vector<std::string> reportingNames(const BackendSet& backends);

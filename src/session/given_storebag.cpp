@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Compares what a session has been given with what the daemon holds.
+// Compares the session's section with the daemon's current one.
 #include "session/given_storebag.h"
 
 #include "platform/log.h"

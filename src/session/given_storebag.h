@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The storebag section that a session has been given. The session's thread.
+// The storebag section that a session uses. The session's thread.
 #pragma once
 
 #include <cstdint>
@@ -20,13 +20,13 @@ class GivenStorebag {
     _section = std::move(section);
     _version = std::move(version);
   }
-  // Gives what the daemon holds now. If back ends must be made anew, because of another version, another
-  // section, or none that may be used, which leaves an empty one, `make` makes them, and this is logged with
-  // the session's ID. What `make` throws leaves what was given before, so that the next call tries again.
+  // Takes the daemon's current section. If it has another version or content, or none may be used (then an
+  // empty one is taken), `make` makes new back ends, and this is logged with the session's ID. If `make`
+  // throws, the earlier section stays, and the next call tries again.
   void follow(StorebagNow now, std::uint32_t sessionID, const std::function<void()>& make);
   void forget() { give(nullptr, std::nullopt); }
 
-  // Something was given.
+  // A section must have been taken.
   const config::StorebagSection& section() const { return *_section; }
   const std::optional<std::string>& version() const { return _version; }
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Keeps the session info and the user info that a client sends.
+// Charges the session info and the user info that a client sends to its user.
 #pragma once
 
 #include <memory>

@@ -39,7 +39,7 @@ void sendMessageWithSessionInfo(const BackendMaking& making, support::MessageLog
   oneShot.fates.taken(message, SessionFates::From::oneShot, oneShot.edits,
                       set->empty() ? std::optional(wire::Reason::no_backends) : std::nullopt);
   for (const auto& [name, backend] : *set) backend->updateState();
-  forbidByWord(*set, making.word);
+  applyProhibitions(*set, making.decision);
   for (const auto& [name, backend] : *set) {
     const auto [decision, answer] =
         backend->sendMessage(message.payload, message.time, message.category, message.type, 0, message.note);

@@ -13,15 +13,15 @@
 namespace veltrad::session {
 
 struct OneShotMessage {
-  // Of the session that took it in, with the message's session info.
+  // The facts of the session that received the message, with the message's session info.
   FamilyFacts facts;
   SessionFates& fates;
   backends::UserInfo userInfo;
   const config::StorebagSection* storebag = nullptr;
   Message message;
-  // What the owner keeps back of the payload.
+  // The fields of the payload that the owner withholds.
   const config::EditedFields* edits = nullptr;
-  // Gets what became of the message, unless it is null because nobody waits for it.
+  // Receives the outcomes of the message; null if nobody waits for them.
   wire::Outcomes* outcomes = nullptr;
 };
 

@@ -25,10 +25,10 @@ struct Message {
   backends::MessageNote note = {};
 };
 
-// As a client gives it. What is missing of category, type and flag is 0.
+// Converts a message dictionary of a client. Missing category, type and flag are 0.
 Message messageOf(Dictionary given);
 
-// Who sends a copy.
+// The sender of a copy.
 struct CopySender {
   VeltradSessionDelegate& delegate;
   Aggregation& aggregation;
@@ -41,7 +41,7 @@ struct CopySender {
 CopySent sendCopy(const CopySender& sender, std::int32_t hierarchy, const Message& message);
 
 // Sends the message through every back end in order and returns the answer for the client, if there is one.
-// Adds what became of it to `outcomes`, unless that is null because nobody waits for it.
+// Adds its outcomes to `outcomes`, which is null if nobody waits for them.
 std::optional<std::string> offerToBackends(const BackendSet& backends, Message message,
                                            support::MessageLog& messageLog, wire::Outcomes* outcomes);
 

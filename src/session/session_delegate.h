@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a session needs of the daemon: storebags, and its place among related sessions.
+// The daemon's services for a session: storebags, and its place in a family.
 #pragma once
 
 #include <cstdint>
@@ -15,7 +15,7 @@ namespace veltrad::session {
 
 class VeltradSession;
 
-// What a session tells of itself: its family, and those who look after the device.
+// The facts of a session that its family and the control socket need.
 struct FamilyFacts {
   // Never null. Identifies the session.
   std::shared_ptr<Aggregation> aggregation;
@@ -34,7 +34,7 @@ struct FamilyPlace {
   std::int32_t hierarchy;
 };
 
-// What a session that follows its storebag is to have.
+// The current section for a session that follows its storebag.
 struct StorebagNow {
   std::shared_ptr<const config::StorebagSection> section;  // null: nothing that may be used
   std::optional<std::string> version;
@@ -50,10 +50,10 @@ class VeltradSessionDelegate {
   // Never downloads.
   virtual std::optional<std::string> storebagVersionForSession(const VeltradSession& session) = 0;
 
-  // What the daemon holds for the session now; nothing: the session keeps what it has. Never downloads.
+  // The daemon's current section for the session; absent if the session keeps its own. Never downloads.
   virtual std::optional<StorebagNow> storebagNow(const VeltradSession&) { return std::nullopt; }
 
-  // What is behind a message's want of back ends, if it is the refusal of a storebag; else `why` itself.
+  // The reason why a storebag was refused, if that is why the session has no back ends; else `why`.
   virtual wire::Reason reasonBehind(const VeltradSession&, wire::Reason why) { return why; }
 
   // Updates the facts of a session that is in a family.

@@ -2,7 +2,7 @@
 // Makes the entries of sessions and messages.
 #include "session/session_fates.h"
 
-#include "config/noted_changes.h"
+#include "config/field_change_recorder.h"
 #include "session/routing.h"
 #include "session/session_delegate.h"
 #include "wire/constants.h"
@@ -74,7 +74,7 @@ void SessionFates::taken(Message& message, From from, const config::EditedFields
   message.note.number = entry.message;
   message.note.session = entry.session;
   if (edits && !edits->empty())
-    config::NotedChanges(_pen, {.time = entry.time, .message = entry.message}).changed(*edits);
+    config::FieldChangeRecorder(_pen, {.time = entry.time, .message = entry.message}).changed(*edits);
   if (entry.aggregatedTo == 0) return;
   wire::StepEntry step;
   step.message = entry.message;

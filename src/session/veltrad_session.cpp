@@ -42,7 +42,7 @@ VeltradSession::VeltradSession(const SessionServices& services, VeltradSessionDe
       _sessionIDString(std::move(sessionIDString)),
       _account(connection->memoryAccount()),
       _aggregation(std::make_shared<Aggregation>(std::move(connection))),
-      _word(services.gate),
+      _ownerFilter(services.gate),
       _fates(services.fates) {
   _services.device.copyUniqueDeviceID(_deviceid, sizeof _deviceid);
 }
@@ -87,18 +87,18 @@ bool VeltradSession::charged(wire::OptionalDictionary given, backends::SharedDic
 
 void VeltradSession::keepUserInfo(const backends::SharedDictionary& info) {
   _saidWithoutUserInfo = false;
-  _userInfo = _word.allowed(info);
+  _userInfo = _ownerFilter.allowed(info);
   _fates.forget();
 }
 
 void VeltradSession::hearOwner() {
-  _word.hear([this] {
+  _ownerFilter.hear([this] {
     _fates.forget();
-    _word.takeIdentity(_services.device, _deviceid, _backends.get());
-    _userInfo = _word.allowed(_userInfo.given);
+    _ownerFilter.takeIdentity(_services.device, _deviceid, _backends.get());
+    _userInfo = _ownerFilter.allowed(_userInfo.given);
     if (!_backends) return;
     for (const auto& [name, backend] : *_backends) backend->setUserInfoDict(_userInfo);
-    _leftFamily ? forbidByWord(*_backends, _word.now()) : updateSessionWithDefaultSessionInfo();
+    _leftFamily ? applyProhibitions(*_backends, _ownerFilter.now()) : updateSessionWithDefaultSessionInfo();
   });
 }
 
@@ -140,10 +140,11 @@ void VeltradSession::createBackends(const BackendSet* before) {
   facts.take(_userInfo);
   facts.combinedSessionIDString = _sessionIDString;
   facts.connection = backends::connectionNumber(_sessionIDString);
-  auto made = session::createBackends(
-      {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, false, _fates.comesFrom(_storebag.section().origin, _sessionInfo), before},
-      &_storebag.section(), _sessionInfo.get(), std::move(facts));
+  auto made =
+      session::createBackends({_services.factory, _services.device, _services.library, _services.clock,
+                               _services.counters, _ownerFilter.now(), _account, false,
+                               _fates.comesFrom(_storebag.section().origin, _sessionInfo), before},
+                              &_storebag.section(), _sessionInfo.get(), std::move(facts));
   _backends.swap(made);
   cleanUp(made.get());  // those that were replaced
 }
@@ -152,8 +153,8 @@ void VeltradSession::updateSessionWithDefaultSessionInfo() {
   _sessionDelegate.userInfoUpdatedForSession(familyFacts());
   updateStates(_backends.get());
   _sessionDelegate.updateDownstreamSessions(familyFacts());
-  // After the daemon knows the back ends, so that it tells them of any later word.
-  if (_backends) forbidByWord(*_backends, _word.now());
+  // Only now, because the daemon knows the back ends and tells them every later decision.
+  if (_backends) applyProhibitions(*_backends, _ownerFilter.now());
 }
 
 std::optional<std::vector<std::string>> VeltradSession::fetchReportingStates() const {
@@ -248,7 +249,7 @@ bool VeltradSession::hasBackends(Message& message, Origin origin) {
 
 std::nullopt_t VeltradSession::refused(Message message, wire::Reason why, SessionFates* oneShot) {
   _services.counters.count(why);
-  static_cast<void>(_word.restrict(message.payload));
+  static_cast<void>(_ownerFilter.restrict(message.payload));
   (oneShot ? *oneShot : _fates)
       .refused(familyFacts(), std::move(message), oneShot ? Origin::oneShot : Origin::client,
                _sessionDelegate.reasonBehind(*this, why));
@@ -263,7 +264,7 @@ SessionFates& VeltradSession::fates() {
 // Sets the message's time. There are back ends.
 std::optional<std::string> VeltradSession::sendMessage(Message message, wire::Outcomes* outcomes,
                                                        Origin origin) {
-  const config::EditedFields edits = _word.restrict(message.payload);
+  const config::EditedFields edits = _ownerFilter.restrict(message.payload);
   message.time = _services.clock.now();
   _services.counters.count(wire::Reason::message_taken_in);
   sayWithoutUserInfo();
@@ -310,7 +311,7 @@ void VeltradSession::uploadFileAtPath(std::string path, std::string extensionTok
 
 void VeltradSession::uploadLogData(Array logData, wire::UploadLogDataReply completionHandler) {
   hearOwner();
-  const config::EditedFields edits = _word.restrict(logData);
+  const config::EditedFields edits = _ownerFilter.restrict(logData);
   backends::MessageNote note = fates().taken(SessionFates::Item::logData);
   note.edits = &edits;
   const bool uploaded = uploadLogDataArray(_backends.get(), logData, note);
@@ -348,13 +349,13 @@ void VeltradSession::sendMessageWithSessionInfo(wire::OptionalDictionary info,
   }
   _services.counters.count(wire::Reason::one_shot_taken_in);
   hearOwner();
-  const config::EditedFields edits = _word.restrict(message.payload);
+  const config::EditedFields edits = _ownerFilter.restrict(message.payload);
   wire::Outcomes outcomes;
   veltrad::session::sendMessageWithSessionInfo(
       {_services.factory, _services.device, _services.library, _services.clock, _services.counters,
-       _word.now(), _account, true, fates.comesFrom(storebag->origin, kept)},
+       _ownerFilter.now(), _account, true, fates.comesFrom(storebag->origin, kept)},
       _services.messageLog,
-      {familyFacts(), fates, _word.allowed(identity), storebag.get(), std::move(message), &edits,
+      {familyFacts(), fates, _ownerFilter.allowed(identity), storebag.get(), std::move(message), &edits,
        reply ? &outcomes : nullptr});
   if (reply) reply("finished", std::move(outcomes));
 }

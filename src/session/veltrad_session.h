@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// VeltradSession: the daemon's side of one client connection. Only the connection's thread calls it; it tells
-// others what they need to know about it (FamilyFacts, Aggregation).
+// VeltradSession: the daemon's side of one client connection. Only the connection's thread calls it; other
+// threads use its FamilyFacts and Aggregation.
 #pragma once
 
 #include <cstdint>
@@ -19,7 +19,7 @@
 #include "platform/preferences.h"
 #include "session/backend_set.h"
 #include "session/given_storebag.h"
-#include "session/heard_word.h"
+#include "session/owner_filter.h"
 #include "session/session_fates.h"
 #include "support/message_log.h"
 #include "wire/client_session_interface.h"
@@ -32,7 +32,7 @@ class VeltradSessionDelegate;
 struct FamilyFacts;
 struct Message;
 
-// What every session uses. It outlives the sessions.
+// The services of all sessions. They must outlive the sessions.
 struct SessionServices {
   backends::BackendFactory& factory;
   support::DeviceIdentity& device;
@@ -48,7 +48,8 @@ struct SessionServices {
   platform::FateRing* fates = nullptr;
 };
 
-// The agent's list and the connection own it. The delegate outlives it.
+// The agent's list and the connection own it. The delegate must outlive it.
+// Its 15 fields are its services, what its client has said, and what it got for that.
 class VeltradSession final : public wire::ClientSessionInterface {
  public:
   static std::shared_ptr<VeltradSession> initWithSessionDelegate(const SessionServices& services,
@@ -73,7 +74,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   void sendMessageWithSessionInfo(wire::OptionalDictionary sessionInfo, wire::OptionalDictionary userInfo,
                                   std::uint16_t category, std::uint16_t type,
                                   wire::OptionalDictionary payload, wire::SentReply reply) override;
-  // Goes on with the storebag that the daemon holds now, if sessions follow theirs.
+  // Takes over the daemon's current storebag, if sessions follow their storebags.
   void takeNews() override;
   // Sends the stop message, flushes, and cleans up and releases the back ends.
   void end() override;
@@ -88,9 +89,9 @@ class VeltradSession final : public wire::ClientSessionInterface {
   VeltradSession(const SessionServices& services, VeltradSessionDelegate& delegate,
                  std::shared_ptr<ipc::Connection> connection, std::string sessionIDString);
 
-  // Takes the owner's word over if it has changed, also into the back ends.
+  // Applies the owner's decision if it has changed, also to the back ends.
   void hearOwner();
-  // From the storebag that was given. Those in `before`, if it is not null, are taken over from.
+  // Makes the back ends of the current section. They take over from those in `before`, which may be null.
   void createBackends(const BackendSet* before);
   std::optional<std::vector<std::string>> fetchReportingStates() const;
   void updateSessionWithDefaultSessionInfo();
@@ -98,9 +99,9 @@ class VeltradSession final : public wire::ClientSessionInterface {
   // Charges the dictionary to the user. False, and counted, if it is too much.
   bool charged(wire::OptionalDictionary given, backends::SharedDictionary& kept);
   void keepUserInfo(const backends::SharedDictionary& info);
-  // Whose message it is; those of the session itself are not counted as lost.
+  // The origin of a message; the session's own messages are not counted as lost.
   using Origin = SessionFates::From;
-  // Hears the owner's word first.
+  // Applies the owner's decision first.
   bool hasBackends(Message& message, Origin origin);
   // These check the message and return the answer for the client. `outcomes` is null if nobody waits for
   // them.
@@ -136,7 +137,7 @@ class VeltradSession final : public wire::ClientSessionInterface {
   std::uint32_t _sessionID = 0;
   backends::SharedDictionary _sessionInfo;
   backends::UserInfo _userInfo;
-  HeardWord _word;
+  OwnerFilter _ownerFilter;
   SessionFates _fates;
   // It must not join its family again.
   bool _leftFamily = false;

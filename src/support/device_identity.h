@@ -28,7 +28,7 @@ class DeviceIdentity {
   std::optional<std::string> deviceHardwareModel() { return value("HWModelStr"); }
   std::optional<std::string> deviceSerialNumber() { return value("SerialNumber"); }
 
-  // Nothing: they cannot be read just now.
+  // Absent if they cannot be read at the moment.
   struct NameAndType {
     std::optional<std::string> name;
     std::optional<std::string> productType;

@@ -44,7 +44,7 @@ std::optional<Fate> fateAfter(const wire::StepEntry& entry) {
   }
 }
 
-// What an answer says that is no more than that all is well.
+// Whether a reason means no more than success.
 bool saysNothing(std::optional<wire::Reason> reason) {
   using wire::Reason;
   return reason == Reason::event_posted || reason == Reason::datagram_sent ||

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What became of each message, put together from the record of fates. One thread.
+// Collects the fate of each message from the record of fates. One thread.
 #pragma once
 
 #include <cstdint>
@@ -13,7 +13,7 @@
 
 namespace veltrad::support {
 
-// One message in one back end. Its 15 fields are what is told of it.
+// One message in one back end. Its 16 fields are what is known of it.
 struct BackendFate {
   std::optional<wire::StandingEntry> standing;  // none: the back end was not made
   wire::Fate fate = wire::Fate::none;

@@ -89,7 +89,7 @@ void FateReader::readSession(const wire::SessionEntry& entry) {
   forgetOld();
 }
 
-// Those of a batch go into its post, and are forgotten when it has ended.
+// The messages of a batch move to its post, and are forgotten when the post has ended.
 std::vector<std::uint64_t> FateReader::messagesOf(const wire::StepEntry& entry) {
   if (entry.message != 0) {
     if (entry.step == Step::dropped) {

@@ -14,7 +14,7 @@
 
 namespace veltrad::support {
 
-// What is known of a message's session.
+// The known facts of a message's session.
 struct ToldSession {
   wire::SessionEntry entry;
   std::optional<std::string> session;
@@ -51,11 +51,12 @@ class FateReader {
    public:
     virtual ~Listener() = default;
     virtual void taken(const ToldMessage& message) = 0;
-    // Also of messages that were not told, because they were overwritten.
+    // Also called for messages whose own entry was overwritten.
     virtual void stepped(const ToldStep& step) = 0;
   };
 
-  // `keep`: entries refer to no older ones than so many positions. The listener outlives the reader.
+  // `keep`: the number of positions by which a referred entry may be older. The listener must outlive the
+  // reader.
   FateReader(Listener& listener, std::uint64_t keep) : _listener(listener), _keep(keep) {}
 
   void read(std::uint64_t position, const wire::FateWords& words);

@@ -46,7 +46,7 @@ Gunzip::State Gunzip::add(std::string_view& piece, const std::function<void(std:
     if (result == Z_STREAM_END) return _state = piece.empty() ? State::ended : State::tail;
     if (result == Z_MEM_ERROR) return _state = State::shortage;
     if (result != Z_OK && result != Z_BUF_ERROR) return _state = State::broken;
-    // After the last byte zlib may still have some of what it becomes.
+    // After the last byte zlib may still hold output.
   } while (piece.empty() && _stream->avail_out == 0);
   return _state;
 }

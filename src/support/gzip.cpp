@@ -82,7 +82,7 @@ class Deflation {
   // Writes to what is left of the room and returns the result of deflate().
   int run(int flush) { return deflate(&stream, flush); }
   bool full() const { return stream.avail_out == 0; }
-  // What the room holds.
+  // The output in the buffer.
   std::string_view made() const { return {_room.get(), kPieceBytes - stream.avail_out}; }
   void sayFailure(int result) const {
     logError("compressDataWithZlibOrGzip: zlib error while attempting compression: \"%s\" Message: \"%s\"",

@@ -25,7 +25,7 @@ constexpr std::int64_t kDaySeconds = 86'400;
 constexpr std::size_t kDigestPiece = 64u << 10;
 constexpr const char* kNoMemory = "no memory";
 
-// Of the bytes of a file, or of a text. Nothing: the file cannot be read.
+// The digest of a file or of a text; absent if the file cannot be read.
 std::optional<std::string> digestOf(std::string_view bytes, const FileDescriptor* file,
                                     std::uint64_t fileBytes) {
   const std::unique_ptr<EVP_MD_CTX, decltype(&EVP_MD_CTX_free)> context(EVP_MD_CTX_new(), EVP_MD_CTX_free);
@@ -185,7 +185,7 @@ void History::write() {
 }
 
 bool History::writeNow(std::chrono::steady_clock::time_point deadline) {
-  // What it leaves for want of memory waits for the next time, and nobody for this one.
+  // What it leaves for lack of memory waits for the next time, and nobody for this one.
   return _queue.run([this] { write(); }, deadline);
 }
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What left the device, kept for its owner to read. Any thread records; the disk writer's thread writes.
+// Records what left the device, for its owner. Any thread records; the disk writer's thread writes.
 #pragma once
 
 #include <atomic>
@@ -23,16 +23,16 @@ class Clock;
 
 namespace veltrad::support {
 
-// Each departure is a record with its body, written when it begins, and a second one when it has ended, which
-// names the first. What is recorded waits in memory until the next writeSoon() and is synced then, all of it
-// at once. What the disk does not take goes on waiting.
+// Each departure has a record with its body, made when it begins, and a second record with the result, which
+// names the first. Records wait in memory until the next writeSoon(), which writes and syncs all of them.
+// Records that cannot be written keep waiting.
 //
-// Its 11 fields are what the records are made with, and those that wait.
+// Its 13 fields are what the records are made with, and those that wait.
 class History {
  public:
   // Records wait for the disk; beyond these bytes there is no room for another one.
   static constexpr std::size_t kMostBytes = 4u << 20;
-  // Bodies above this share of the space are kept as length and digest.
+  // A body larger than this part of the space is kept only as length and digest.
   static constexpr std::uint64_t kLargestShare = 4;
 
   // Bytes of a departure, in memory or, so many, in a file.
@@ -42,10 +42,10 @@ class History {
     std::uint64_t fileBytes = 0;
   };
 
-  // What the constructor takes outlives it.
+  // The constructor's arguments must outlive it.
   History(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer);
 
-  // Nothing: from now on nothing is recorded. What is on disk stays.
+  // Sets the space; absent stops recording. Files on disk stay.
   void keep(std::optional<HistorySpace> space);
   bool keeps() const { return _keeps.load(std::memory_order_relaxed); }
   bool hasRoom() const { return !keeps() || _waitingBytes.load(std::memory_order_relaxed) < kMostBytes; }
@@ -55,7 +55,7 @@ class History {
   // `end`: {"status", "error", "transmissions"}.
   void ended(std::uint64_t number, Dictionary end);
 
-  // Mends the files, once, before anything else is written.
+  // Repairs the files, once, before anything else is written.
   void mend();
   // Queues a write if something waits, and once a day one that removes what is too old. To be called several
   // times a second.

@@ -56,7 +56,7 @@ bool eachPiece(int file, std::uint64_t offset, std::uint64_t bytes, const Take& 
   return true;
 }
 
-// Collects what is written in few calls.
+// Collects bytes so that they are written in few calls.
 class Appending {
  public:
   explicit Appending(int file) : _file(file) {}
@@ -198,7 +198,7 @@ void HistoryFolder::trim(const HistorySpace& space, std::int64_t today) {
   }
   std::uint64_t bytes = std::accumulate(all.begin(), all.end(), std::uint64_t{0},
                                         [](std::uint64_t sum, const auto& day) { return sum + day.second; });
-  // A shortened file is written anew, so more goes than has to.
+  // A shortened file is rewritten, so more is removed than necessary.
   const std::uint64_t target = space.bytes - space.bytes / 8;
   const bool tooMuch = bytes > space.bytes;
   for (auto at = all.begin(); tooMuch && at != all.end() && bytes > target; ++at) {

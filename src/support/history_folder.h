@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The files of the history, one a day: appends, mends and removes. One thread at a time.
+// Appends to, repairs and removes the files of the history, one for each day. One thread at a time.
 #pragma once
 
 #include <cstddef>
@@ -31,7 +31,7 @@ struct HistoryRecord {
 // A list, so that putting those back that could not be written needs no memory.
 using HistoryRecords = std::list<HistoryRecord>;
 
-// What the owner of the device allows it to take.
+// The space that the owner of the device allows.
 struct HistorySpace {
   std::int64_t days = 0;
   std::uint64_t bytes = 0;
@@ -56,8 +56,8 @@ class HistoryFolder {
 
   // Cuts off what a killed daemon has left unfinished. Returns how many bytes that were.
   std::uint64_t mend();
-  // Appends the records in order, syncs, and removes those from the list that are on disk, whole; the others
-  // left no trace. The error is that of the first one that is not.
+  // Appends the records in order, syncs, and removes from the list those that are completely on disk; nothing
+  // of the others is written. The error is that of the first record that failed.
   void append(HistoryRecords& records, std::string& error);
   // Removes the oldest records, until the rest is within the space.
   void trim(const HistorySpace& space, std::int64_t today);

@@ -132,7 +132,7 @@ void MessageLog::put(std::string_view format, std::initializer_list<std::string_
   using Put = platform::DiskWriter::Queue::Put;
   const Put put = _queue.put([this] { writeWaiting(); }, 1);
   if (put == Put::taken) return;
-  // Nobody will take them.
+  // No job will write these lines.
   const auto lost = takeWaiting();
   _counters.count(put == Put::full ? wire::Reason::log_line_queue_full : wire::Reason::log_line_no_thread,
                   lost.size());

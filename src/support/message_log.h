@@ -39,7 +39,7 @@ class MessageLog {
   // Limit for the lines that wait; a single one may be longer.
   static constexpr std::size_t kMostBytes = 4u << 20;
 
-  // What it takes must outlive it. The directory is made by the first message.
+  // The constructor's arguments must outlive it. The directory is made by the first message.
   MessageLog(const platform::Clock& clock, std::string directory, platform::DiskWriter& writer,
              platform::Counters& counters);
   template <typename... Values>
@@ -71,7 +71,7 @@ class MessageLog {
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   // If there are any, a job that will take them is queued.
   std::vector<std::string> _waiting GUARDED_BY(_mutex);
-  // Of these and of those that are being written.
+  // The bytes of the waiting lines and of those that are being written.
   std::size_t _bytes GUARDED_BY(_mutex) = 0;
 
   // Last, because its destructor ends the writer's use of the others.

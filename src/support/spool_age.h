@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which posts of the spool are too old, also where the clock was wrong when they were made. Values in,
-// verdicts out.
+// Decides which posts of the spool are too old, also if the clock was wrong when they were made. Pure
+// functions.
 #pragma once
 
 #include <cstdint>
@@ -9,8 +9,8 @@
 
 namespace veltrad::support {
 
-// A post's age counts from its time (its order, in microseconds since 1970). Where that lies ahead of the
-// clock or before kEarliestTime, or the clock shows no time, it counts from when that was noticed. One
+// A post's age counts from its time (its order, in microseconds since 1970). If that time is ahead of the
+// clock or before kEarliestTime, or the clock is wrong, the age counts from when this was noticed. One
 // thread.
 class SpoolAge {
  public:
@@ -32,8 +32,8 @@ class SpoolAge {
   std::optional<Doubted> _doubted;
 };
 
-// Gives orders (ascending) that lie ahead of the clock others, close before now, so that the days of their
-// posts count from now. Which comes before which stays as it is. Without a clock nothing changes.
+// Replaces orders (ascending) that are ahead of the clock by orders just before now, so that the age of their
+// posts counts from now. Their sequence stays the same. If the clock is wrong, nothing changes.
 void bringBack(std::vector<std::uint64_t>& orders, double now);
 
 }  // namespace veltrad::support

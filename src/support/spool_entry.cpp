@@ -116,7 +116,7 @@ std::optional<SpoolEntry> readSpoolContent(std::string_view content) {
   entry.events = static_cast<std::uint32_t>(numberIn(*all, "events"));
   entry.uid = static_cast<std::uint32_t>(numberIn(*all, "uid"));
   entry.connection = static_cast<std::uint32_t>(numberIn(*all, "connection"));
-  // What is missing is read so that less leaves.
+  // Missing values get the more restrictive default.
   entry.asksEntry = all->boolean("asksEntry").value_or(true);
   entry.client = *client;
   entry.about = *about;

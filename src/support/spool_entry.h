@@ -14,15 +14,15 @@
 
 namespace veltrad::support {
 
-// Of a post: the same for each time that it is sent.
+// The ID of a post, the same for each transmission.
 using PostID = std::array<unsigned char, 16>;
 PostID newPostID();
 // 32 lower-case hexadecimal digits, and back.
 std::string textOf(const PostID& id);
 std::optional<PostID> postIDOf(std::string_view text);
 
-// As it is to be sent, whose it is, and what decides whether it may leave. Its 13 fields are the keys of the
-// file.
+// A post as it is to be sent, its owner, and the data that decides whether it may leave. Its 14 fields are
+// the keys of the file.
 struct SpoolEntry {
   PostID id{};
   // When it was made, in microseconds since 1970; no two posts of a daemon have the same.
@@ -38,7 +38,7 @@ struct SpoolEntry {
   // As in http::Departure; the names in `client` are those that may leave.
   Dictionary client;
   Dictionary about;
-  // The owner keeps back a name that chooses the client entry.
+  // The owner withholds a name that chooses the client entry.
   bool namesHidden = false;
   // Before it was written: how often it was sent, and what went wrong last.
   std::uint16_t tries = 0;
@@ -50,9 +50,9 @@ struct SpoolEntry {
 
 // A name of a version, a binary property list, and the CRC-32 of both, big-endian.
 std::string writeSpoolEntry(const SpoolEntry& entry);
-// Nothing: it is torn, or no such file.
+// Nothing: it is damaged, or no such file.
 std::optional<SpoolEntry> readSpoolEntry(std::string_view file);
-// What follows the name and precedes the checksum.
+// Reads the content between the version name and the checksum.
 std::optional<SpoolEntry> readSpoolContent(std::string_view content);
 
 }  // namespace veltrad::support

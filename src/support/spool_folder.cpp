@@ -73,7 +73,7 @@ std::optional<std::vector<SpoolFolder::Name>> SpoolFolder::names(double now) con
   return names;
 }
 
-// A name that is lost with the power is found ahead of the clock again.
+// If the power fails before the rename is on disk, the next start finds the old name again.
 void SpoolFolder::bringNamesBack(std::vector<Name>& names, double now) const {
   if (names.empty() || static_cast<double>(names.back().order) <= now * 1e6) return;
   std::vector<std::uint64_t> orders;
@@ -120,7 +120,7 @@ SpoolFolder::Read SpoolFolder::readFile(const Name& name) const {
 bool SpoolFolder::remove(const Name& name) const {
   const std::string path = pathOf(name);
   if (_files.unlink(path)) return true;
-  // A disk that may not be written says so before it looks.
+  // A read-only disk reports this error before it checks whether the file exists.
   struct stat status {};
   return ::lstat(path.c_str(), &status) != 0 && (errno == ENOENT || errno == ENOTDIR);
 }

@@ -19,7 +19,7 @@ std::uint16_t SpoolIndex::addressNumber(const std::string& address) {
 
 std::uint16_t SpoolIndex::userNumber(std::uint32_t uid) {
   auto found = std::find_if(_users.begin(), _users.end(), [uid](const User& one) { return one.uid == uid; });
-  // One without posts makes room, so that there are no more than posts.
+  // Reuses a number without posts, so that there are no more numbers than posts.
   if (found == _users.end())
     found = std::find_if(_users.begin(), _users.end(), [](const User& one) { return one.posts == 0; });
   if (found == _users.end()) found = _users.insert(_users.end(), User{});

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What lies in the spool, as a table of fixed size in memory: which post is next, and which has to go. The
-// owner guards it.
+// An index of the spool's posts in memory, of bounded size: finds the next post to send, and the one to drop.
+// The owner guards it.
 #pragma once
 
 #include <array>
@@ -74,8 +74,8 @@ class SpoolIndex {
                    const std::function<bool(const SpoolPlace&)>& blocked = nullptr);
   // The oldest of all, unless it is being written or sent.
   SpoolPlace* oldest();
-  // The one that has to go, as long as there is too much, and why: above a user's share that user's oldest,
-  // else the oldest of who takes most. One that is being sent stays.
+  // The post to drop while a bound is exceeded, and the reason: the oldest of a user above his share, else
+  // the oldest of the user who takes most. A post that is being sent stays.
   SpoolPlace* excess(Excess& why);
   // In order, from the first one after this order.
   template <typename Visit>
@@ -109,7 +109,7 @@ class SpoolIndex {
   std::vector<std::string> _addresses;
   std::vector<Amount> _amounts;  // by address; without the oldest
   std::vector<User> _users;
-  // Posts of all connections and addresses that fall together, so that most have not to be looked for.
+  // Numbers of posts by a hash of connection and address, so that most searches are avoided.
   std::array<std::uint32_t, kCounts> _counts{};
 };
 

@@ -15,7 +15,7 @@ class Root;
 
 namespace veltrad::support {
 
-// Under which preferences the identifiers of this device are kept.
+// The preferences with the identifiers of this device.
 inline constexpr const char* kIdentifierRespectingConsent = "uuidRespectDNU";
 inline constexpr const char* kIdentifierOverridingConsent = "uuidOverrideDNU";
 

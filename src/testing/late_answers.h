@@ -11,13 +11,13 @@
 
 namespace veltrad::testing {
 
-// Its thread exists from the first delay on. Answers that are not due when it is destroyed are dropped.
+// Its thread starts with the first delay. Answers that are not due when it is destroyed are dropped.
 class LateAnswers {
  public:
   using Clock = std::chrono::steady_clock;
 
   ~LateAnswers();
-  // Of the answers from now on.
+  // Sets the delay of all further answers.
   void setDelay(std::chrono::milliseconds delay);
   // Runs `answer` when the delay has passed and all earlier answers have been given; at once without any.
   void give(std::function<void()> answer);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What has come, and what the test has ordered. Any thread.
+// The messages that have arrived, and the test's instructions. Any thread.
 #pragma once
 
 #include <chrono>

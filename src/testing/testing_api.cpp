@@ -3,18 +3,18 @@
 #include <cstring>
 #include <optional>
 
-#include "testing/stand_in.h"
+#include "testing/test_daemon.h"
 #include "veltra/testing.h"
 
 struct veltra_testing_daemon {
-  veltrad::testing::StandIn standIn;
+  veltrad::testing::TestDaemon standIn;
 };
 
 veltra_testing_daemon* veltra_testing_start(char** error) {
   if (error) *error = nullptr;
   std::string text;
   if (auto directory = veltrad::testing::TestRoot::make(text)) {
-    auto* daemon = new veltra_testing_daemon{veltrad::testing::StandIn(std::move(*directory))};
+    auto* daemon = new veltra_testing_daemon{veltrad::testing::TestDaemon(std::move(*directory))};
     const auto problem = daemon->standIn.start();
     if (!problem) return daemon;
     delete daemon;

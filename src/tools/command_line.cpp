@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads what CLI11 knows of a command line.
+// Reads the description of a command line from CLI11.
 #include "tools/command_line.h"
 
 #include <CLI/CLI.hpp>

@@ -14,7 +14,7 @@ namespace veltrad::tools {
 struct Argument {
   // "-o", "--output"; of a positional argument one name, as help shows it: "FILE".
   std::vector<std::string> names;
-  // What follows an option: "DIR", "N". Empty: nothing.
+  // The placeholder of an option's value: "DIR", "N"; empty if it has no value.
   std::string value;
   // "0 - 65535"; empty: help says what is allowed.
   std::string range;
@@ -22,7 +22,7 @@ struct Argument {
   std::string group;
   std::string help;
   std::string byDefault;
-  // The values that there are, where completions shall offer them.
+  // The possible values, for completions.
   std::vector<std::string> choices;
   bool positional = false;
   bool required = false;

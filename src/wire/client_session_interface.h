@@ -21,7 +21,7 @@ template <typename... Results>
 using Reply = std::function<void(Results...)>;
 
 using StringReply = Reply<std::optional<std::string>>;
-// Of a message: what each back end has done with it until now.
+// The reply to a message, with its outcome in each back end so far.
 using SentReply = Reply<std::optional<std::string>, Outcomes>;
 using NamesReply = Reply<std::optional<std::vector<std::string>>>;
 using FlushReply = Reply<std::optional<std::string>, std::optional<ReportingError>>;
@@ -53,7 +53,7 @@ class ClientSessionInterface {
                                           std::uint16_t category, std::uint16_t type,
                                           OptionalDictionary payload, SentReply reply) = 0;
 
-  // Not a client's: called between two calls after somebody has nudged the connection.
+  // Not a client's call: runs between two calls after the connection was nudged.
   virtual void takeNews() {}
   // The last call, made once, after the connection's invalidation handler has run.
   virtual void end() = 0;

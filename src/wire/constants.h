@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The names that the daemon, the library and storebags share.
+// Names that the daemon, the library and storebags share.
 #pragma once
 
 namespace veltrad::wire {
@@ -7,7 +7,7 @@ namespace veltrad::wire {
 // A client must hold this entitlement with the value true.
 inline constexpr const char* kVeltraEntitlement = "com.florn.private.veltrad";
 
-// What a peer of the control socket must hold; root and the daemon's own user need neither. "control"
+// The entitlements for peers of the control socket; root and the daemon's own user need neither. "control"
 // includes "observe".
 inline constexpr const char* kObserveEntitlement = "com.florn.veltrad.observe";
 inline constexpr const char* kControlEntitlement = "com.florn.veltrad.control";

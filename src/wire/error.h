@@ -22,7 +22,7 @@ ReportingError makeReportingError(std::string description, std::int64_t code);
 
 // {"domain", "code", "description"}
 Dictionary dictionaryOfError(const ReportingError& error);
-// What is missing or of another type is empty; the code is then -1.
+// Missing values, or those of another type, are empty; the code is then -1.
 ReportingError errorOfDictionary(const Dictionary& dictionary);
 
 // The error of a call whose callback the daemon destroyed without calling it.

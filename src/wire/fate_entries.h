@@ -11,7 +11,7 @@
 
 namespace veltrad::wire {
 
-// Changes with the layout of any entry: who reads must know the same.
+// Version of the layout; it changes with any entry, and reader and writer must agree.
 inline constexpr std::uint32_t kFateLayout = 2;
 inline constexpr std::size_t kFateWords = 7;
 using FateWords = std::array<std::uint64_t, kFateWords>;
@@ -27,12 +27,12 @@ inline constexpr std::uint64_t kNoMessage = std::uint64_t{1} << 63;
 
 inline constexpr std::uint8_t kNoReason = 255;
 static_assert(kReasonCount < kNoReason);
-// Of an entry's `reason`.
+// The reason in an entry's `reason`.
 constexpr std::optional<Reason> reasonIn(std::uint8_t number) {
   return number == kNoReason ? std::nullopt : std::optional(static_cast<Reason>(number));
 }
 
-// A text, and in the entries after it what of it did not fit.
+// A text; the rest that does not fit is in the following entries.
 struct TextEntry {
   EntryKind kind = EntryKind::text;
   std::uint8_t unused = 0;
@@ -45,7 +45,8 @@ struct MoreTextEntry {
   char bytes[55] = {};
 };
 
-// What is known of a message's session. At most three back ends that were not made find room.
+// The facts of a message's session. It has room for three back ends that were not made.
+// Its 14 fields are its layout in the record.
 struct SessionEntry {
   static constexpr std::size_t kNotMade = 3;
   enum Known : std::uint8_t { clientTypeKnown = 1, sessionIDKnown = 2, clientVersionKnown = 4 };
@@ -67,6 +68,7 @@ struct SessionEntry {
 };
 
 // A message, a file or log data that was taken in.
+// Its 14 fields are its layout in the record.
 struct MessageEntry {
   enum class From : std::uint8_t { client, session, oneShot };
   enum class Item : std::uint8_t { message, file, logData };
@@ -88,7 +90,7 @@ struct MessageEntry {
   std::uint8_t more[16] = {};
 };
 
-// How a back end stands, and why.
+// The state of a back end, and the reason.
 struct StandingEntry {
   enum Differs : std::uint8_t { clientDiffers = 1, serviceDiffers = 2 };
 
@@ -107,6 +109,7 @@ struct StandingEntry {
 
 // A step of a message, of a batch or of a post. Of one that is kept, `text` is what went wrong, and `bytes`
 // are the seconds until its address is tried again.
+// Its 14 fields are its layout in the record.
 struct StepEntry {
   EntryKind kind = EntryKind::step;
   Step step = Step::none;

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What became of a message in a back end, and on which way: one table of names for the daemon and its tools.
+// The results of a message in a back end, and the steps to them: one table of names for the daemon and its
+// tools.
 #pragma once
 
 #include <algorithm>
@@ -45,9 +46,9 @@ constexpr std::string_view nameOf(Fate fate) {
   return kFateNames[static_cast<std::size_t>(fate)];
 }
 
-// A step on a message's way, in the order in which it happens. held: in a batch as above, or a datagram that
-// the socket did not take. The last two tell no step of their own: `none` is the fate of that name, and
-// `restored` says that a flush has put fields that were changed before back as they were given.
+// A processing step of a message, in order. held: in a batch as above, or a datagram that the socket did not
+// take. The last two are no steps: `none` is the fate of that name, and `restored` says that a flush has
+// restored the original values of fields that were changed before.
 enum class Step : std::uint8_t {
   taken,
   aggregated,
@@ -81,7 +82,7 @@ constexpr std::string_view nameOf(Step step) {
   return kStepNames[static_cast<std::size_t>(step)];
 }
 
-// The back ends by number, from 1; 0 stands for all of a session's.
+// The back ends by number, from 1; 0 means all back ends of a session.
 inline constexpr std::string_view kBackendNames[] = {"",
                                                      kVeltraBackendAmpery,
                                                      kVeltraBackendDashboard,
@@ -97,8 +98,8 @@ constexpr std::uint8_t numberOfBackend(std::string_view name) {
                                           : static_cast<std::uint8_t>(found - std::begin(kBackendNames));
 }
 
-// What a back end has decided for a message, and why: what kept the message back, else the reason of the back
-// end's state.
+// A back end's decision on a message and the reason: why the message was not sent, else the reason for the
+// back end's state.
 struct Decision {
   Fate fate = Fate::none;
   Reason reason = Reason::takes_no_messages;

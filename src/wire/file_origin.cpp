@@ -45,7 +45,7 @@ std::string_view wordAfter(std::string_view text, std::string_view mark) {
 }
 
 // A mount in no list that can be read is usual below a chroot. Programs and other machines serve files
-// without a device, but for those of a disk that root has mounted by FUSE.
+// without a device, except for those of a disk that root has mounted by FUSE.
 FileOrigin unlisted(int descriptor) {
   struct statx facts {};
   if (::statx(descriptor, "", AT_EMPTY_PATH | AT_STATX_DONT_SYNC, STATX_TYPE, &facts) != 0) return {};

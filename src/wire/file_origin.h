@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What kind of file system an open file belongs to, determined without contacting a file server.
+// Determines the kind of file system of an open file, without contacting a file server.
 #pragma once
 
 #include <sys/types.h>

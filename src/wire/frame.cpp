@@ -67,7 +67,7 @@ std::pair<char*, std::size_t> FrameReader::room(std::size_t least) {
   return {_buffer.get() + _filled, _capacity - _filled};
 }
 
-// Drops what was handed out. While the buffer grows, both the old and the new one are charged.
+// Drops the consumed bytes. While the buffer grows, both the old and the new one are charged.
 bool FrameReader::resizeBuffer(std::size_t bytes) {
   if (_memory && bytes > _capacity && !_memory->bufferOf(_capacity + bytes)) return false;
   std::unique_ptr<char[]> fresh(bytes > 0 ? new (std::nothrow) char[bytes] : nullptr);

@@ -72,8 +72,8 @@ class FrameReader {
   // `memory` must outlive the reader.
   explicit FrameReader(FrameMemory& memory) : _memory(&memory) {}
 
-  // The place for the next bytes, at least `least`, or null if there is no memory for them. To be followed by
-  // received() with the number of bytes that were written there.
+  // Returns room for the next bytes, at least `least`, or null if there is no memory. After writing there,
+  // call received() with the number of bytes.
   std::pair<char*, std::size_t> room(std::size_t least = kIdleReadBytes);
   void received(std::size_t count) { _filled += count; }
   // The next whole frame. `impossible` is final; the first time, `frame` holds the header in question.

@@ -21,7 +21,7 @@ inline constexpr const char* kUploadFile = "uploadFileAtPath:extensionToken:comp
 inline constexpr const char* kUploadLogData = "uploadLogData:completionHandler:";
 }  // namespace operation
 
-// What those who look after the device ask on the control socket.
+// Questions on the control socket.
 namespace question {
 inline constexpr const char* kConfig = "config";
 inline constexpr const char* kContents = "contents";
@@ -54,7 +54,7 @@ inline constexpr const char* kNames[] = {
     "environment", "clientTypes", "consent",         "messageLog",     "sandbox", "descriptors", "clock"};
 }  // namespace check
 
-// What the daemon calls.
+// Events that the daemon sends.
 namespace event {
 inline constexpr const char* kGoodbye = "goodbye";
 inline constexpr const char* kRemoveUploadedFile = "removeUploadedFile:";

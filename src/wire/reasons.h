@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The reasons that are counted for messages and for what carries them: one table for the daemon and its
-// tools.
+// The counted reasons for messages, posts, datagrams and files: one table for the daemon and its tools.
 #pragma once
 
 #include <cstddef>
@@ -18,11 +17,11 @@ enum class Reason : std::uint8_t {
 };
 
 struct ReasonEntry {
-  // What is counted: "message", "log data".
+  // The kind of thing that is counted: "message", "log data".
   std::string_view concern;
   // [a-z][a-z0-9_]*, for programs.
   std::string_view name;
-  // What happened, then why; the key in run/veltrad/counters.json.
+  // The event, then its cause; the key in run/veltrad/counters.json.
   std::string_view text;
 };
 

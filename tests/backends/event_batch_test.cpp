@@ -58,7 +58,7 @@ TEST(HeldEvents, FollowTheSessionIDAndPayForWhatTheyHold) {
   bounds.userKept = 3 * size.charged;
   platform::MemoryBudget budget(bounds);
   const auto account = budget.accountOf(1);
-  const auto held = std::make_shared<backends::HeldEvents>(counters, platform::FatePen());
+  const auto held = std::make_shared<backends::HeldEvents>(counters, platform::FateWriter());
   account->add(held);
   const auto add = [&](int number, std::uint64_t built) {
     auto charge = account->keep(size.charged);

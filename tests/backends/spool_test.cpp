@@ -55,13 +55,14 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
     changed.merge(changes);
     return config::parseSection({{"httppost", Dictionary{{"clients", Array{changed}}}}});
   };
-  const auto word = [](config::PolicyRules rules, std::optional<wire::Reason> refusal = std::nullopt) {
-    return config::OwnersWord{std::make_shared<const config::Policy>(std::move(rules)), refusal, nullptr, 0};
+  const auto decision = [](config::PolicyRules rules, std::optional<wire::Reason> refusal = std::nullopt) {
+    return config::OwnerDecision{std::make_shared<const config::Policy>(std::move(rules)), refusal, nullptr,
+                                 0};
   };
   config::PolicyRules hosts, names;
   hosts.hosts = {{"other.test"}, Array{"other.test"}};
   names.backends = {{"dashboard"}, Array{"dashboard"}};
-  const auto open = word({});
+  const auto open = decision({});
   using Facts = std::optional<backends::ClientFacts>;
   const Facts yes = backends::ClientFacts{true, "US", "Desktop", "Workbench 3", 0.9}, unknown;
   Facts no = yes, abroad = yes;
@@ -82,7 +83,7 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
   constexpr auto none = std::nullopt;
   const struct {
     const support::SpoolEntry& post;
-    const config::OwnersWord& word;
+    const config::OwnerDecision& decision;
     const config::StorebagSection* section;
     const Facts& facts;
     std::optional<wire::Reason> reason;
@@ -100,15 +101,15 @@ TEST(SpoolVerdicts, TheOwnerThenTheEntryThenConsentDecideWhatMayLeave) {
               {hidden, open, other.get(), yes, none},
               {free, open, other.get(), no, none},
               {free, open, nullptr, no, none},
-              {free, word({}, privacy_off), nullptr, yes, privacy_off},
-              {free, word({}, policy_consent), nullptr, no, policy_consent},
-              {free, word(hosts), nullptr, yes, policy_hosts},
-              {asks, word(names), good.get(), yes, policy_backends},
+              {free, decision({}, privacy_off), nullptr, yes, privacy_off},
+              {free, decision({}, policy_consent), nullptr, no, policy_consent},
+              {free, decision(hosts), nullptr, yes, policy_hosts},
+              {asks, decision(names), good.get(), yes, policy_backends},
               {asks, open, good.get(), unknown, none, true},
               {free, open, nullptr, unknown, none},
-              {asks, word({}, privacy_off), nullptr, unknown, privacy_off}};
+              {asks, decision({}, privacy_off), nullptr, unknown, privacy_off}};
   for (const auto& row : rows) {
-    const auto [reason, waits] = backends::verdictOnLeaving(row.post, row.word, row.section, row.facts);
+    const auto [reason, waits] = backends::verdictOnLeaving(row.post, row.decision, row.section, row.facts);
     EXPECT_TRUE(reason == row.reason && waits == row.waits) << &row - rows;
     if (reason) {
       const std::string_view text = wire::entryOf(backends::countedFromSpool(*reason)).text;

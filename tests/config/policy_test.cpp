@@ -265,7 +265,7 @@ TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
   const auto sent = [&gate] {
     Dictionary message{{"kept", 1}, {"number", "0170"}, {"secret", 2}};
     config::EditedFields changes;
-    if (const auto& fields = gate.word()->fields) fields->apply(message, changes);
+    if (const auto& fields = gate.decision()->fields) fields->apply(message, changes);
     return message;
   };
   owner.files.failReads("/secret", platform::FileFailure::Kind::shortage);
@@ -275,7 +275,7 @@ TEST(OwnerGate, TakesAPolicyOverAtOnceAlsoWhileTheSecretCannotBeRead) {
   owner.says(R"({"reporting": "off", "remove": ["secret"], "hash": ["number"]})");
   EXPECT_TRUE(gate.refresh());
   EXPECT_FALSE(gate.refresh());
-  EXPECT_EQ(gate.word()->refusal, policy_reporting);
+  EXPECT_EQ(gate.decision()->refusal, policy_reporting);
   EXPECT_EQ(sent(), (Dictionary{{"kept", 1}}));  // what cannot be hashed yet is removed
   owner.files.failReads("/secret", std::nullopt);
   EXPECT_TRUE(gate.refresh());

@@ -1,15 +1,17 @@
 # SPDX-License-Identifier: Apache-2.0
 """The drain with messages that no gateway has published, and with faults of the database and the stream."""
+import http.client
 import os
 import pathlib
 import re
+import resource
 import signal
 import subprocess
 import time
 import urllib.request
 
 import side
-from devices import GZIP, FleetTest, envelope, packed, post_id
+from devices import GZIP, FleetTest, envelope, packed, post_id, together
 
 
 class Drain(FleetTest):
@@ -127,6 +129,34 @@ class Drain(FleetTest):
         status = pathlib.Path(f"/proc/{self.fleet.facts['pids']['drain']}/status").read_text()
         self.assertLess(int(re.search(r"^VmHWM:\s+(\d+)", status, re.M)[1]), 128 << 10)
         self.assertEqual(self.metric("veltra_drain_restarts_total"), 0)
+
+    def test_want_of_memory_costs_a_request_or_a_turn_and_nothing_else(self):
+        numbers, restarts = range(8), self.metric("veltra_drain_restarts_total")
+        bodies = [envelope({"n": number, "t": "x" * (12 << 20)}, client="short") for number in numbers]
+        ids, pids = [post_id() for _ in numbers], {name: self.fleet.facts["pids"][name] for name in ("gateway1", "drain")}
+
+        def post(number):
+            try:
+                return self.direct().post("/events", bodies[number], X_VLT_Post_ID=ids[number]).status
+            except (OSError, http.client.HTTPException):
+                return 0
+
+        def limit(name, bytes_=None):
+            size = int(re.search(r"^VmSize:\s+(\d+)", pathlib.Path(f"/proc/{pids[name]}/status").read_text(), re.M)[1]) << 10
+            hard = resource.prlimit(pids[name], resource.RLIMIT_AS)[1]
+            resource.prlimit(pids[name], resource.RLIMIT_AS, (hard if bytes_ is None else size + bytes_, hard))
+        limit("gateway1", 1 << 20)
+        statuses = together([lambda number=number: post(number) for number in numbers])
+        self.assertTrue({200} != set(statuses) <= {200, 429, 0}, statuses)
+        limit("gateway1")
+        limit("drain", 1 << 20)
+        self.assertEqual(together([lambda number=number: post(number) for number in numbers]), [200] * len(numbers))
+        side.wait_until(lambda: self.metric("veltra_drain_restarts_total") > restarts, "a turn without memory")
+        limit("drain")
+        side.wait_until(self.fleet.is_carried, "all are in the table")
+        self.assertEqual(self.fleet.query("SELECT count(*), count(DISTINCT fields->>'n') FROM veltra.events WHERE client_id = 'short'"),
+                         [[str(len(bodies))] * 2])
+        self.assertTrue(all(self.fleet.runs(name) and self.fleet.facts["pids"][name] == pid for name, pid in pids.items()))
 
     def test_users_that_were_refused_for_a_while_come_back(self):
         def replace(old, new):

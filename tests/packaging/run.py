@@ -31,6 +31,7 @@ for name in null zero full random urandom tty; do touch dev/$name && mount --bin
 mkdir dev/pts dev/shm && mount -t devpts -o newinstance,ptmxmode=0666 devpts dev/pts && ln -s pts/ptmx dev/ptmx
 ip link set lo up
 mkdir -p run/old && pivot_root . run/old && umount -l run/old
+mount --make-rshared /  # for credentials of units; systemd leaves this to who runs a container
 exec env -i container=chroot PATH=/usr/sbin:/usr/bin /lib/systemd/systemd
 """
 
@@ -140,6 +141,19 @@ class Test:
         exposure = self.box.run("systemd-analyze security --no-pager veltrad.service").splitlines()[-1]
         assert float(re.search(r"\d+\.\d+", exposure)[0]) <= 1.6, exposure
 
+    def test_links_of_documents(self):
+        """Each leads to a file of the same package."""
+        links = 0
+        for package in PACKAGES:
+            files = set(self.box.run(f"dpkg -L {package}").splitlines())
+            for name in (name for name in files if name.endswith((".md", ".html"))):
+                text = re.sub(r"^```.*?^```$", "", (self.box.path / name[1:]).read_text(), flags=re.M | re.S)
+                for link in re.findall(r"""\]\(([^)\s]+)|(?:href|src)="([^"]+)""", text):
+                    path = "".join(link).split("#")[0]
+                    links += not re.match("[a-z]+:", path)
+                    assert re.match("[a-z]+:|$", path) or os.path.normpath(f"{name}/../{path}") in files, f"{name}: {path}"
+        assert links > 100, links
+
     def test_first_message_by_the_readme(self):
         section = re.search(r"^## Install\n(.*?)^## ", (SOURCE / "README.md").read_text(), re.M | re.S)[1]
         set_up, report = re.findall(r"^```sh\n(.*?)^```$", section, re.M | re.S)[-2:]
@@ -208,17 +222,22 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
         shutil.rmtree(self.box.path / "System")
 
     def test_the_gateway(self):
-        """Its units run in spite of their restrictions, as users of their own, also before there is a stream or a database."""
+        """Its units run in spite of their restrictions, as users of their own, also before there is a stream or a database, and read
+        the credentials that they are given."""
+        self.box.run("mkdir -m 700 /srv/secrets; (umask 077; echo name:password > /srv/secrets/stream)")
         for unit, user, port in (("veltra-gateway", "veltra-gateway|6[0-9]{4}", 8081), ("veltra-gateway-drain", "veltra-drain", 8082)):
             assert self.box.run(f"systemctl is-enabled {unit} || true") == "disabled\n"
-            self.box.run(f"systemctl start {unit}")
+            options = f"/run/systemd/system/{unit}.service.d"
+            self.box.run(f"mkdir -p {options}; (echo '[Service]\nLoadCredential=stream:/srv/secrets/stream\nExecStart='\n"
+                         f"sed -n 's|^ExecStart=.*|& --credentials %d/stream|p' /lib/systemd/system/{unit}.service) > {options}/credentials.conf\n"
+                         f"systemctl daemon-reload; systemctl start {unit}")
             asked = "for path in live ready; do curl -s -o /dev/null -w '%{http_code} ' http://127.0.0.1:" + f"{port}/$path; done"
             assert self.box.run(asked) == "200 503 ", unit
             found = self.box.run(f"ps -o user:32= -p $(systemctl show -P MainPID {unit})").strip()
             assert re.fullmatch(user, found), found
             exposure = self.box.run(f"systemd-analyze security --no-pager {unit}.service").splitlines()[-1]
             assert float(re.search(r"\d+\.\d+", exposure)[0]) <= 2.0, exposure
-            self.box.run(f"systemctl stop {unit}")
+            self.box.run(f"systemctl stop {unit}; rm -r {options}; systemctl daemon-reload")
         files = self.box.run("stat -c '%a %U:%G' /var/lib/veltra-drain")
         assert files == "750 veltra-drain:veltra-drain\n", files
 
@@ -237,7 +256,7 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
             subprocess.run(["dpkg-deb", "--root-owner-group", "--build", tree, package], check=True,
                            stdout=subprocess.DEVNULL)
             shutil.rmtree(tree)
-        before = self.box.run("systemctl show -p MainPID veltrad")
+        before, lab = (self.box.run(f"systemctl show -p MainPID {unit}") for unit in ("veltrad", "veltra-lab"))
         self.box.run("apt-get install -q -y /packages/*.deb")
         assert "8.0-2" in self.box.run("dpkg-query -W veltrad")
         client.communicate(timeout=DEADLINE)  # it ends, whether or not the daemon that it knew has ended
@@ -245,6 +264,7 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
         self.box.run("veltractl send --client-type 7 --category 5 --type 83")
         self.received('"_status":83')
         assert self.box.run("systemctl show -p MainPID veltrad") != before
+        assert self.box.run("systemctl show -p MainPID veltra-lab") == lab != "MainPID=0\n"
         assert (self.box.path / "etc/veltrad/ca.pem").exists()
 
     def test_a_query_by_the_readme_of_fleet(self):
@@ -261,11 +281,11 @@ int main(void) { veltra_testing_stop(veltra_testing_start(NULL)); }' | cc -x c -
 
     def test_remove_and_purge(self):
         self.box.run("apt-get remove -q -y " + " ".join(PACKAGES))
-        for unit in ("veltrad.service", "veltrad.socket", "veltra-gateway", "veltra-gateway-drain"):
+        for unit in ("veltrad.service", "veltrad.socket", "veltra-gateway", "veltra-gateway-drain", "veltra-lab"):
             assert self.box.run(f"systemctl is-active {unit}", check=False) == "inactive\n", unit
         assert not (self.box.path / "usr/libexec/veltrad").exists()
         assert (self.box.path / "etc/veltrad/ca.pem").exists(), "removal alone keeps the configuration"
-        self.box.run("systemctl stop veltra-lab; dpkg --purge " + " ".join(PACKAGES))
+        self.box.run("dpkg --purge " + " ".join(PACKAGES))
         self.box.run("rm -r /srv/veltra /etc/systemd/system/veltra-gateway*.service.d /etc/postgresql/15/main/conf.d/veltra.conf")
         left = self.box.run("find / /run -xdev -name '*veltra*' -not -path '/packages/*' -o -xdev -name mobile").split()
         assert not left, left

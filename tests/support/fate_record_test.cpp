@@ -7,7 +7,7 @@
 #include <thread>
 
 #include "fakes/machine.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "support/fate_book.h"
 
 namespace veltrad {
@@ -102,7 +102,7 @@ TEST(FateRing, ATextStandsAsLongAsTheLastEntryThatNamesIt) {
 
 TEST(FateBook, FollowsAPostThroughTheSpool) {
   Record record;
-  const platform::FatePen pen(&record.ring, "httppost");
+  const platform::FateWriter pen(&record.ring, "httppost");
   const std::uint64_t message = record.message(record.session("lamp"));
   wire::StepEntry posted;
   posted.message = message;
@@ -129,7 +129,7 @@ TEST(FateBook, FollowsAPostThroughTheSpool) {
 
 TEST(FateBook, FollowsEachMessageThroughItsBatchAndPost) {
   Record record;
-  const platform::FatePen https(&record.ring, "httppost"), dashboard(&record.ring, "dashboard");
+  const platform::FateWriter https(&record.ring, "httppost"), dashboard(&record.ring, "dashboard");
   const auto session = record.session("lamp");
   const std::uint64_t messages[] = {record.message(session), record.message(session), record.message(session),
                                     record.message(session)};
@@ -198,7 +198,7 @@ TEST(FateRing, ManyWriteWhileReadersFallBehind) {
   for (int writer = 0; writer < kWriters; ++writer) {
     threads.emplace_back([&record, &writing, writer] {
       const std::string client(static_cast<std::size_t>(40 + 10 * writer), static_cast<char>('a' + writer));
-      const platform::FatePen pen(&record.ring, "httppost");
+      const platform::FateWriter pen(&record.ring, "httppost");
       for (int i = 0; i < kMessages; ++i) {
         wire::StepEntry step;
         step.message = record.message(record.session(client));

@@ -12,7 +12,7 @@ namespace veltrad::backends {
 
 class EnergyLog;
 
-// Reads nothing of its section. The energy log outlives it.
+// Does not read its section. The energy log must outlive it.
 class AmperyBackend final : public VeltraBackend {
  public:
   static std::shared_ptr<AmperyBackend> initWithName(EnergyLog& energyLog, platform::Counters& counters,

@@ -19,7 +19,7 @@ namespace veltrad::backends {
 // 0640). Symbolic links are not followed.
 class EnergyLog {
  public:
-  // The clock and the counters outlive it. The directory must exist.
+  // The clock and the counters must outlive it. The directory must exist.
   EnergyLog(const platform::Clock& clock, platform::Counters& counters, std::string path)
       : _clock(clock), _counters(counters), _path(std::move(path)) {}
 

@@ -19,7 +19,7 @@ class DashboardQueues;
 class LogDataUploads;
 class WorkPool;
 
-// What a dashboard back end uses, and the account that pays for what it keeps. The references outlive it.
+// The services of a dashboard back end, and the account for its memory. The references must outlive it.
 struct DashboardMaking {
   platform::Random& random;
   platform::Clock& clock;
@@ -60,7 +60,7 @@ class DashboardBackend final : public VeltraBackend {
   bool uploadLogData(const Array& logData, const MessageNote& note) override;
   void cleanup() override;
   std::vector<std::string> hosts() const override;
-  // Datagrams with the identifier before do not go on.
+  // Waiting datagrams contain the old identifier.
   void dropIdentified() override { dropWaiting(); }
 
  private:

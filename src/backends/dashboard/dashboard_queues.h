@@ -38,7 +38,7 @@ class DashboardQueues {
     return account ? std::int64_t{account->uid()} : kNobody;
   }
 
-  // What one-shot messages that share a queue have in common.
+  // The key by which one-shot messages share a queue.
   struct Route {
     in_addr_t address = 0;
     in_port_t port = 0;
@@ -49,8 +49,8 @@ class DashboardQueues {
   };
 
   // Returns a queue for a one-shot message on this route, to which one more back end is then connected: one
-  // that awaits no acknowledgement, because all one-shot messages have the same number. Null if there is
-  // none, and room for another; without room one that waits for others, too.
+  // that awaits no acknowledgement, because all one-shot messages have the same number. Null if there is none
+  // and a new queue may be made; at the bound, the least recently joined queue.
   std::shared_ptr<NetworkProcQueue> join(const Route& route);
   // From now on join() finds this queue, too.
   void share(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue);
@@ -59,7 +59,7 @@ class DashboardQueues {
   void lingers(const std::shared_ptr<NetworkProcQueue>& queue, std::int64_t user);
   // Frees a descriptor. False if no queue lingers.
   bool endOldest();
-  // Drops what waits in queues that linger or are shared, if `refuses` says so of their host.
+  // Drops the datagrams of lingering and shared queues whose host `refuses` rejects.
   void dropWaiting(const std::function<bool(const std::string& host)>& refuses);
 
  private:
@@ -68,7 +68,7 @@ class DashboardQueues {
     std::int64_t user;
   };
   void forget(const std::shared_ptr<NetworkProcQueue>& queue) REQUIRES(_mutex);
-  // Those on this route that have not ended, the one that was joined longest ago first.
+  // The active queues on this route, the least recently joined first.
   std::vector<std::shared_ptr<NetworkProcQueue>> sharedOn(const Route& route);
   // This one was joined.
   void joined(const Route& route, const std::shared_ptr<NetworkProcQueue>& queue);

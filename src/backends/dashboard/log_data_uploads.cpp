@@ -26,7 +26,7 @@ std::optional<std::string> archiveOf(const Array& logData) {
 
 std::optional<std::string> LogDataUploads::upload(const std::optional<std::string>& postURL,
                                                   const Array& logData, const DatagramOwner& owner,
-                                                  const platform::FatePen& pen, wire::StepEntry fate) {
+                                                  const platform::FateWriter& pen, wire::StepEntry fate) {
   const auto refused = [&](wire::Reason why) {
     _counters.count(why);
     pen.write(wire::Step::dropped, why, fate);

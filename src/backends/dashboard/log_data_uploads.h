@@ -9,7 +9,7 @@
 #include "base/value.h"
 #include "http/http_client.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 
 namespace veltrad::backends {
 
@@ -20,10 +20,9 @@ class LogDataUploads {
   LogDataUploads(http::HTTPClient& http, platform::Counters& counters) : _http(http), _counters(counters) {}
 
   // Returns the location in the server's answer, whatever its status. Nothing, after one error line, if there
-  // is no answer or it is empty.
-  // What becomes of it is also written with the pen; `fate` says of which upload.
+  // is no answer or it is empty. Also writes the steps with the pen; `fate` names the upload.
   std::optional<std::string> upload(const std::optional<std::string>& postURL, const Array& logData,
-                                    const DatagramOwner& owner, const platform::FatePen& pen,
+                                    const DatagramOwner& owner, const platform::FateWriter& pen,
                                     wire::StepEntry fate);
 
  private:

@@ -29,10 +29,10 @@ class MessageQueue {
   enum class Sending { done, notTaken, forbidden };
   // `first`: it has never been sent.
   using Send = std::function<Sending(std::string_view datagram, bool first)>;
-  // Hears what becomes of a datagram after its first transmission, if it was held: sent, sent again, given up
-  // or acknowledged.
+  // Called for each step of a datagram after its first transmission, or after it was held: sent, sent again,
+  // given up or acknowledged.
   using Tell = std::function<void(std::uint64_t message, wire::Step step, wire::Reason reason)>;
-  // Told of each datagram that has been sent once, and once more when it has been sent for the last time.
+  // Called for each datagram when it was sent first, and when no further transmission follows.
   struct Recorder {
     std::function<std::uint64_t(std::string_view datagram, const DatagramOwner& owner)> sent;
     // `record`: what `sent` returned; `bytes`: of the datagram; `error`: one line, empty: none.
@@ -56,7 +56,7 @@ class MessageQueue {
     std::size_t forbidden = 0;
   };
 
-  // `shared`: by one-shot messages, each of which has its own back end, which starts at event number 1.
+  // `shared`: used by one-shot messages; each has its own back end, which starts at event number 1.
   MessageQueue(
       bool reliableUDP, bool shared, Send send, Recorder recorder = {}, Tell tell = [](auto&&...) {});
 
@@ -69,7 +69,7 @@ class MessageQueue {
   // Removes the oldest datagram with this number, or in a shared queue the one that SentCopies names. Returns
   // how it was acknowledged, or nothing if there is none.
   std::optional<wire::Reason> acknowledge(std::uint16_t eventNumber);
-  // Nothing waits, and no acknowledgement can come that would be taken for that of the next datagram.
+  // True if no datagram waits, and no late acknowledgement could be taken for that of the next datagram.
   bool idle() const { return _pending.empty() && (!_copies || _copies->empty()); }
   // Calls `drop` for each one that waits, and forgets it.
   void clear(const std::function<void(const UDPPacketToSend&)>& drop = {});

@@ -14,7 +14,7 @@
 namespace veltrad::backends {
 
 namespace {
-// Then the pool's other handlers run.
+// After this many, the pool's other handlers run.
 constexpr int kMostReadAtOnce = 64;
 constexpr std::size_t kEventIDAt = offsetof(tagReportingPacketHeader, eventID);
 // Memory of a waiting datagram besides its bytes, and of a socket with its timer and read source.
@@ -25,7 +25,7 @@ DeliverySchedule::Time now() {
   return std::chrono::steady_clock::now();
 }
 
-// Of a first transmission that ended so.
+// The decision for the result of a first transmission.
 wire::Decision decisionOf(wire::Reason first, bool reliable) {
   switch (first) {
     case wire::Reason::datagram_sent:
@@ -98,7 +98,7 @@ void NetworkProcQueue::note(std::uint64_t message, wire::Step step, wire::Reason
   if (message != 0) _kind.pen.write(step, reason, fate);
 }
 
-// And of the one that it pushed out.
+// Also notes the datagram that was dropped to make room.
 void NetworkProcQueue::noteFirst(const MessageQueue::First& first, wire::StepEntry fate) const {
   const wire::Decision decision = decisionOf(first.fate, _kind.reliableUDP);
   const bool held = first.fate == wire::Reason::datagram_held;
@@ -194,7 +194,7 @@ void NetworkProcQueue::dropWaiting() {
   });
 }
 
-// Of those that wait, which are given up.
+// Notes the end of the waiting datagrams, which are given up.
 void NetworkProcQueue::noteEnd(wire::Reason ofSent, wire::Reason ofNotSent) const {
   for (const UDPPacketToSend& one : _messageQueue.pending()) {
     const bool sent = one.state == UDPPacketToSend::awaitsAcknowledgement;

@@ -20,7 +20,7 @@
 #include "base/mutex.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "platform/memory_budget.h"
 #include "wire/fates.h"
 
@@ -35,19 +35,19 @@ class WorkPool;
 // datagrams are charged to the user, and so is the socket once it outlives the back ends. `counters` must
 // outlive the queue.
 //
-// Its 13 fields are the socket, what waits for it and what wakes it up; they end together, under one lock.
+// Its 13 fields are the socket, the waiting datagrams and the timer; they end together, under one lock.
 class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQueue> {
  public:
   struct Kind {
     bool reliableUDP = false;
     bool shared = false;
     std::chrono::milliseconds period{};
-    // The dashboard's address, for those who ask whether it may be reached.
+    // The dashboard's host, for the check whether it may be contacted.
     std::string host;
     std::string address;  // "udp://IP:PORT"
-    // Counts what leaves for the owner's limits of a day; outlives the queue. Null: none.
+    // Counts for the owner's daily limits; must outlive the queue. May be null.
     config::OwnerGate* gate = nullptr;
-    platform::FatePen pen = {};
+    platform::FateWriter pen = {};
   };
   // Starts with one back end. `socket` is connected. `account` may be null.
   NetworkProcQueue(UDPSocket socket, std::unique_ptr<PoolTimer> timer, const Kind& kind,
@@ -62,8 +62,8 @@ class NetworkProcQueue final : public std::enable_shared_from_this<NetworkProcQu
   // `fate`: what the record says of it.
   wire::Decision tryToSendMsg(std::string_view datagram, std::uint16_t eventNumber,
                               const DatagramOwner& owner = {}, const wire::StepEntry& fate = {});
-  // Adds a back end, which later calls cleanup(). False if the queue has already stopped, and for who must be
-  // `alone` also if its acknowledgement could be taken for another's.
+  // Adds a back end, which later calls cleanup(). False if the queue has already stopped; with `alone` also
+  // if acknowledgements could be confused with those of other datagrams.
   bool join(bool alone);
   // Removes a back end. After the last one the queue stops as soon as nothing waits, 9.5 s after the next
   // tick at the latest.

@@ -13,7 +13,7 @@ namespace veltrad::backends {
 // so the second answer to a datagram that was sent twice does not confirm another datagram. A copy that is
 // not answered within 9 ticks, the longest time between two transmissions, is considered lost. If copies were
 // lost, an answer may be matched to an earlier datagram; the later one is then sent once more than necessary.
-// Nobody can tell whose an answer is while copies of several datagrams are unanswered.
+// While copies of several datagrams are unanswered, the match is uncertain.
 class SentCopies {
  public:
   static constexpr std::uint64_t kTicks = 9;

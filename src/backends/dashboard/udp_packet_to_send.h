@@ -11,7 +11,7 @@
 
 namespace veltrad::backends {
 
-// Whose a datagram is, as in http::Departure.
+// The client of a datagram, as in http::Departure.
 struct DatagramOwner {
   std::shared_ptr<const Dictionary> client;
   Dictionary about;

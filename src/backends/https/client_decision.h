@@ -45,7 +45,7 @@ struct ClientVerdict {
   std::optional<double> overrideSampling;
 };
 
-// Why it may not report, whatever the draw: no_consent, the lists, no_filters.
+// Why it may not report, independent of sampling: no_consent, the lists, no_filters.
 std::optional<wire::Reason> refusalBeforeSampling(const config::ClientEntry& entry, const ClientFacts& facts);
 
 ClientVerdict decideOnClient(const config::ClientEntry& entry, const ClientFacts& facts);

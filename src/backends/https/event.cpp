@@ -28,7 +28,7 @@ std::int32_t numberIn(const Dictionary& fields, const char* key, std::int32_t ot
   return fields.contains(key) ? fields.int32(key).value_or(0) : otherwise;
 }
 
-// What filters decide by.
+// The values by which filters select events.
 struct EventKind {
   std::int32_t method;
   std::int32_t status;
@@ -44,7 +44,7 @@ bool settles(const Dictionary& userInfo, const FilterTable& filters, EventKind e
   });
 }
 
-// A text whose length was not foreseen gives its spare room back, because it may be kept for long.
+// Releases spare capacity if the length was not predicted, because the text may be kept for a long time.
 void limitRoom(std::string& text) {
   constexpr std::size_t kMostSpare = 128;
   if (text.capacity() > text.size() + kMostSpare) text.shrink_to_fit();

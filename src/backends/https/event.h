@@ -37,16 +37,16 @@ struct WrittenEvent {
   config::EditedFields edits;
   // Fields that were removed because JSON cannot represent them.
   std::size_t notJSON = 0;
-  // The same user info, filtered by itself and merged again, would change nothing.
+  // True if merging the same user info again, filtered separately, would change nothing.
   bool settled = true;
 };
 
-// The message's payload with these fields: "_startTS" (the session's start, cut to the minute),
-// "_sender", "_clientVersion", "_sessionID", "_eventNumber", "_method", "_status", "_clientTS" and
-// "eventTime" (exact offset from the cut start), "_productFamily", "_productModel", "_osVersion", "_build",
-// "_internal", "_reportVers", "_timezoneOffset" (seconds from GMT). A field whose text is absent is left out.
-// Then the user info that may leave, which replaces fields of both; then the filters. `expectedBytes` may be
-// any number: if it is the length of the text, the buffer is allocated only once.
+// The message's payload with these fields: "_startTS" (the session's start, cut to the minute), "_sender",
+// "_clientVersion", "_sessionID", "_eventNumber", "_method", "_status", "_clientTS" and "eventTime" (exact
+// offset from the cut start), "_productFamily", "_productModel", "_osVersion", "_build", "_internal",
+// "_reportVers", "_timezoneOffset" (seconds from GMT). A field whose text is absent is left out. Then the
+// user info that may leave is merged, which replaces fields of both; then the filters are applied.
+// `expectedBytes` may be any number: if it is the length of the text, the buffer is allocated only once.
 WrittenEvent writeEvent(const SessionFacts& facts, const std::string& productFamily,
                         const NumberedMessage& message, int timeZoneOffset, const FilterTable& filters,
                         std::size_t expectedBytes);

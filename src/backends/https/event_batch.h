@@ -27,7 +27,7 @@ class EventBatch {
     EventSize size;
     // MemoryAccount::nextTurn.
     std::uint64_t turn = 0;
-    // See WrittenEvent; false once the user info or the filters have changed.
+    // See WrittenEvent; false after the user info or the filters have changed.
     bool settled = false;
     // Its message's, in the record of fates.
     std::uint64_t message = 0;
@@ -55,7 +55,7 @@ class EventBatch {
   void restartCount(std::int32_t method) { _counts[method] = 0; }
 
   void setSessionID(const std::string& sessionID);
-  // No event is settled any more.
+  // Marks all events as not settled.
   void unsettle();
   // Returns the events and clears the counts.
   std::deque<Event> take();

@@ -37,7 +37,7 @@ wire::Reason reasonOf(const http::HTTPError& error) {
   return wire::Reason::post_failed;
 }
 
-// Whether the owner keeps back a name by which the client entry is chosen.
+// Whether the owner withholds a name by which the client entry is chosen.
 bool hidesNames(const SessionFacts& facts) {
   const auto name = [](const SharedDictionary& info, const char* key) {
     return info ? info->string(key) : nullptr;
@@ -50,7 +50,7 @@ bool hidesNames(const SessionFacts& facts) {
   return false;
 }
 
-// What is needed to send it again. The request shares its body.
+// Copies the data that is needed to send the post again. The request shares its body.
 void takeForSpool(const std::shared_ptr<SpooledPost>& post, const SessionFacts& facts,
                   http::HTTPRequest& request) {
   support::SpoolEntry& entry = post->entry;
@@ -192,7 +192,7 @@ void EventPosts::endedOrKept(VeltraBackend& backEnd, const std::shared_ptr<Spool
 // Returns the post's number in the record.
 std::uint64_t EventPosts::notePost(const VeltraBackend& backEnd, const http::HTTPRequest& request,
                                    wire::StepEntry fate) {
-  const platform::FatePen& pen = backEnd.pen();
+  const platform::FateWriter& pen = backEnd.pen();
   if (!pen.writes()) return 0;
   fate.post = pen.newNumber();
   fate.text = pen.textOf(request.url);

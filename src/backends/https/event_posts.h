@@ -23,8 +23,8 @@ namespace veltrad::backends {
 class PostSpool;
 struct SpooledPost;
 
-// One object serves all HTTPS post back ends. It outlives them and their posts, and what its constructor
-// takes outlives it. Without a spool posts that fail are lost.
+// One object serves all HTTPS post back ends. It must outlive them and their posts, and what its constructor
+// takes must outlive it. Without a spool posts that fail are lost.
 class EventPosts {
  public:
   EventPosts(http::HTTPClient& http, const platform::Clock& clock, platform::Counters& counters,
@@ -41,7 +41,7 @@ class EventPosts {
     VeltraBackend::FlushCompletion completion;
     // As in http::Departure.
     Dictionary about = {};
-    // What the record of fates is to say of it: its message or batch.
+    // The entry for the record of fates: its message or batch.
     wire::StepEntry fate = {};
   };
 
@@ -54,14 +54,14 @@ class EventPosts {
   std::optional<wire::Decision> postJSONMessage(const std::shared_ptr<VeltraBackend>& backEnd,
                                                 const SessionFacts& facts,
                                                 const std::optional<std::string>& url, Post post);
-  // Failed posts are kept, so that `about` is of use.
+  // True if failed posts are kept, so that `about` is needed.
   bool keepsPosts() const { return _spool != nullptr; }
   // Counts the events as lost, under the reason that it returns, and calls `completion`, if there is one.
   wire::Reason refusePost(VeltraBackend& backEnd, std::size_t eventCount,
                           const VeltraBackend::FlushCompletion& completion, const wire::StepEntry& fate);
   // Logs the lines that were held back. Called before the daemon ends.
   void sayRest();
-  // Frees what is kept from post to post.
+  // Frees the memory that is kept between posts.
   void rest() { _gzip.rest(); }
 
  private:

@@ -12,9 +12,9 @@
 
 namespace veltrad::backends {
 
-// Merges the payload, the fields that it is told to add, and the user info in one pass, in the order of the
-// keys' bytes, and filters each field as it is written; so an event is never a dictionary. Of equal keys the
-// user info counts, then the added field. What it is given must outlive it.
+// Merges the payload, the added fields and the user info in one pass, in the order of the keys' bytes, and
+// filters each field as it is written; so no dictionary is made of the event. Of equal keys the user info
+// wins, then the added field. The arguments must outlive it.
 class EventWriter {
  public:
   // Overwrites the text. `method` and `status` are those for the filters.

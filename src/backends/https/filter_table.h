@@ -27,11 +27,12 @@ class FilterTable {
   };
   // Whether a filter names the field.
   bool concerns(const std::string& name) const;
-  // Filters the event in place by its own "_method" and "_status" (0 if missing). `changes` hears the names.
+  // Filters the event in place by its own "_method" and "_status" (0 if missing). Reports the names to
+  // `changes`.
   Outcome filterEvent(Dictionary& event, config::FieldChanges& changes) const;
   // True if every field is kept.
   bool empty() const { return !_filters || _filters->ofKey.empty(); }
-  // What happens to a field of an event with this method and status. Not empty().
+  // The action on a field of an event with this method and status. The table must not be empty.
   config::FilterAction actionOn(std::string_view key, std::int32_t method, std::int32_t status) const;
   // The digest of a text, or of the JSON text of a number or boolean. Nothing for other values, which are
   // then removed, because a field that is to be hashed must never leave in clear.

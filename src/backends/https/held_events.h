@@ -14,12 +14,12 @@
 #include "backends/lock_ranks.h"
 #include "base/mutex.h"
 #include "platform/counters.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 #include "platform/memory_budget.h"
 
 namespace veltrad::backends {
 
-// Shared, because the account may use it after its back end has gone. The counters outlive it.
+// Shared, because the account may use it after its back end has gone. The counters must outlive it.
 class HeldEvents final : public platform::Evictable {
  public:
   // The charge pays for the events and for what a flush makes of them.
@@ -32,7 +32,8 @@ class HeldEvents final : public platform::Evictable {
   // Before the next event: there is room, its method's threshold requires a flush, or the batch is full.
   enum class Need { room, flush, bound };
 
-  HeldEvents(platform::Counters& counters, const platform::FatePen& pen) : _counters(counters), _pen(pen) {}
+  HeldEvents(platform::Counters& counters, const platform::FateWriter& pen)
+      : _counters(counters), _pen(pen) {}
   // Counts the events that are lost, for example after a second start, or when user info never came.
   ~HeldEvents() override;
 
@@ -60,7 +61,7 @@ class HeldEvents final : public platform::Evictable {
   std::size_t settle() REQUIRES(_mutex);
 
   platform::Counters& _counters;
-  const platform::FatePen _pen;
+  const platform::FateWriter _pen;
   std::atomic<std::uint64_t> _sessionIDChanges{0};
 
   mutable Mutex _mutex BACKEND_LOCK;

@@ -7,7 +7,7 @@
 
 #include "backends/https/event_posts.h"
 #include "backends/https/json_fields.h"
-#include "config/noted_changes.h"
+#include "config/field_change_recorder.h"
 #include "config/owner_gate.h"
 #include "platform/counters.h"
 #include "platform/locale.h"
@@ -57,7 +57,7 @@ HTTPSPostBackend::HTTPSPostBackend(const HTTPSPostMaking& making, const std::str
   setDisplayURL(profile->displayURL);
 }
 
-// What is new in the filters reaches the events of the batch as ever: with the user info of the flush.
+// New filters apply to the batched events only in the user info that the flush adds.
 void HTTPSPostBackend::takeOver(VeltraBackend& before) {
   VeltraBackend::takeOver(before);
   auto* other = dynamic_cast<HTTPSPostBackend*>(&before);
@@ -329,7 +329,7 @@ bool HTTPSPostBackend::mergeUserInfo(HeldEvents::Taken& taken, const SessionFact
 void HTTPSPostBackend::noteEdits(const SessionFacts& facts, const NumberedMessage& message,
                                  const config::EditedFields& edits) const {
   if (edits.empty() && !facts.userInfoEdits) return;
-  config::NotedChanges changes(
+  config::FieldChangeRecorder changes(
       pen(), {.time = platform::FateRing::microseconds(message.timestamp), .message = message.note.number});
   if (facts.userInfoEdits) changes.changed(*facts.userInfoEdits, message.note.edits);
   changes.changed(edits);
@@ -341,7 +341,7 @@ void HTTPSPostBackend::noteMerge(const SessionFacts& facts, const config::Edited
                                  std::uint64_t batch) const {
   if (!pen().writes()) return;
   const config::EditedFields* kept = facts.userInfoEdits.get();
-  config::NotedChanges changes(pen(), {.time = pen().ring()->now(), .batch = batch});
+  config::FieldChangeRecorder changes(pen(), {.time = pen().ring()->now(), .batch = batch});
   for (const auto& [name, value] : *facts.sentUserInfo) {
     if (edits.removed.contains(name)) continue;
     if (edits.hashed.contains(name) || (kept && kept->hashed.contains(name))) {

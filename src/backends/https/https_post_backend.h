@@ -22,13 +22,13 @@ namespace veltrad::backends {
 
 class EventPosts;
 
-// What an HTTPS post back end uses. The references outlive it.
+// The services of an HTTPS post back end. The references must outlive it.
 struct HTTPSPostMaking {
   platform::Random& random;
   platform::Locale& locale;
   platform::Counters& counters;
   EventPosts& posts;
-  platform::FatePen pen;
+  platform::FateWriter pen;
   PostIdentity::Sources identity;
   // Null: the owner sets no limits.
   config::OwnerGate* gate = nullptr;
@@ -52,7 +52,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   BackendActivity activity() const override;
   std::vector<std::string> hosts() const override;
   bool hostsAreFixed() const override { return false; }
-  // How it stands, for tools. The session's thread.
+  // The state with its details, for tools. The session's thread.
   const HTTPSPostState& clientState() const { return _clientState; }
 
  private:
@@ -77,7 +77,7 @@ class HTTPSPostBackend final : public VeltraBackend {
   void noteEdits(const SessionFacts& facts, const NumberedMessage& message,
                  const config::EditedFields& edits) const;
   void noteMerge(const SessionFacts& facts, const config::EditedFields& edits, std::uint64_t batch) const;
-  // For the history of what left, if one is kept: names of fields that the owner keeps back, too.
+  // For the history of what left, if one is kept: names of fields that the owner withholds, too.
   bool recorded() const;
   void addOwnersEdits(const SessionFacts& facts, const MessageNote& note, config::EditedFields& edits) const;
   Dictionary about(const SessionFacts& facts, const config::EditedFields& edits) const;
@@ -91,12 +91,12 @@ class HTTPSPostBackend final : public VeltraBackend {
   HTTPSPostState _clientState;
   // The batch is registered with the user's account.
   bool _evictable = false;
-  // With which the settled events of the batch were written.
+  // The user info with which the settled events of the batch were written.
   SharedDictionary _writtenInfo;
   FilterTable _writtenFilters;
-  // Of the last event; most of the next ones are about as long.
+  // The length of the last event; most later ones are similar.
   std::size_t _lastLength = 0;
-  // Of the events in the batch, and perhaps of some that were dropped from it.
+  // The changed fields of the events in the batch, possibly with those of dropped events.
   config::EditedFields _batchEdits;
 
   // Shared with the back end before, if this one has taken over from it. Constant once others know this one.

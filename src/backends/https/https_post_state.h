@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether and how an HTTPS post back end reports for its current client. The session's thread.
+// The reporting state of an HTTPS post back end for its current client. The session's thread.
 #pragma once
 
 #include <cstdint>
@@ -18,8 +18,8 @@
 
 namespace veltrad::backends {
 
-// Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. What an
-// update does not reach keeps its earlier value. Its 13 fields are the profile, the services and the results.
+// Part of its back end: reads the back end's facts and sets its hierarchy and sampling threshold. A value
+// that an update does not set stays.
 class HTTPSPostState {
  public:
   // `profile` has "clients".
@@ -46,7 +46,8 @@ class HTTPSPostState {
   // The number of the client entry that holds; nothing: none does.
   std::optional<std::size_t> entry() const { return _match.entry; }
   const std::optional<double>& overrideSampling() const { return _overrideSampling; }
-  // Of the client entry that decides, or, if the session requires no user info, has given the address.
+  // The match with the client entry that decides or, if the session requires no user info, provides the
+  // address.
   const ClientMatch& match() const { return _match; }
 
  private:

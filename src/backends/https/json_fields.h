@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What JSON can represent of an event's fields.
+// Restricts an event's fields to those that JSON can represent.
 #pragma once
 
 #include <cstddef>

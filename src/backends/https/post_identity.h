@@ -36,8 +36,8 @@ class PostIdentity {
   bool takeCustomClientID(const std::optional<std::string>& clientName,
                           const std::optional<std::string>& serviceName);
 
-  // Reads the identifiers anew; that of a client and service has to be taken again. Those that cannot be read
-  // just now stay.
+  // Reads the identifiers again; that of a client and service has to be taken again. Those that cannot be
+  // read at the moment stay.
   void renewIdentifiers();
   void rereadConsent();
 

@@ -31,7 +31,7 @@ struct BodyCompression {
 http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, const PostText& text,
                                   std::optional<EventMap> eventMap, BodyCompression compression);
 
-// What an answer's status means for the back end and for the posted events.
+// The meaning of an answer's status for the back end and the posted events.
 struct PostVerdict {
   bool disablesBackend;
   wire::Reason reason;

@@ -32,7 +32,7 @@ http::DepartureEnd endOf(const http::HTTPResult& result) {
   return end;
 }
 
-// Goes on while the machine sleeps, and nobody sets it.
+// A clock that continues while the machine sleeps and is never set.
 double runningSeconds() {
   timespec time{};
   ::clock_gettime(CLOCK_BOOTTIME, &time);
@@ -74,7 +74,7 @@ void PostSpool::wake() {
 }
 
 std::optional<std::string> PostSpool::admit(SpooledPost& post) {
-  auto admission = _queue.admit(http::addressOf(post.entry.url), post.entry.connection);
+  auto admission = _queue.admit(std::string(http::addressOf(post.entry.url)), post.entry.connection);
   post.entry.order = admission.order;
   post.emptied = admission.emptied;
   return std::move(admission.refusal);
@@ -82,7 +82,7 @@ std::optional<std::string> PostSpool::admit(SpooledPost& post) {
 
 void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result) {
   support::SpoolEntry& entry = post->entry;
-  const std::string address = http::addressOf(entry.url);
+  const std::string address(http::addressOf(entry.url));
   entry.tries = static_cast<std::uint16_t>(triesOf(result));
   if (isToBeKept(result)) {
     entry.lastError = outcomeOf(result);
@@ -97,7 +97,8 @@ void PostSpool::ended(const std::shared_ptr<SpooledPost>& post, const http::HTTP
 
 void PostSpool::keep(const std::shared_ptr<SpooledPost>& post) {
   const support::SpoolEntry& entry = post->entry;
-  if (!_queue.add(placeOf(entry, post->fate), http::addressOf(entry.url), entry.uid, post->emptied)) {
+  if (!_queue.add(placeOf(entry, post->fate), std::string(http::addressOf(entry.url)), entry.uid,
+                  post->emptied)) {
     _counters.count(Reason::spool_refused_by_owner, entry.events);
     _notes.dropped(placeOf(entry, post->fate), Reason::refused_by_owner);
     return recordUnsent(entry, entry.tries);
@@ -106,7 +107,7 @@ void PostSpool::keep(const std::shared_ptr<SpooledPost>& post) {
   const std::size_t bytes = entry.body.size() + entry.url.size();
   const auto job = [this, post] {
     try {
-      // Whoever has dropped it meanwhile had no copy of it to record.
+      // Recorded here if it was dropped meanwhile, because the dropping thread had no copy.
       if (!keepOnDisk(post->entry)) recordUnsent(post->entry, post->entry.tries);
     } catch (const std::bad_alloc&) {
       drop({post->entry.order, post->entry.id}, Reason::spool_disk, &post->entry);
@@ -155,11 +156,11 @@ bool PostSpool::drop(const Name& name, Reason reason, const support::SpoolEntry*
     return true;
   }
   const bool onDisk = place->state != State::writing;
-  // What was kept has been settled before.
+  // Kept events were settled before.
   if (onDisk) _counters.eventTaken(place->events);
   _counters.count(countedFromSpool(reason), place->events);
   _notes.dropped(*place, reason);
-  // Whoever writes or sends it has a copy, and records it.
+  // The thread that writes or sends the post has a copy and records it.
   const bool records = place->tries > 0 && _notes.keepsRecords() &&
                        (place->state == State::waiting || (place->state == State::writing && post));
   const auto kept = records && !post ? read(name).entry : std::nullopt;
@@ -198,7 +199,7 @@ std::size_t PostSpool::empty(Reason reason, Deadline deadline) {
   const auto names = _queue.empty();
   for (const Name& name : names) drop(name, reason);
   for (const Name& name : unread.value_or(std::vector<Name>())) dropUnread(name, reason);
-  // What was being written removes itself.
+  // Posts that were being written remove their own files.
   static_cast<void>(drain(deadline));
   return names.size() + (unread ? unread->size() : 0);
 }
@@ -277,7 +278,7 @@ void PostSpool::load(const Name& name, const Each& each) {
   if (!entry) return;
   support::SpoolPlace place = placeOf(*entry, 0);
   place.bytes = bytes;
-  _queue.addLoaded(place, http::addressOf(entry->url), entry->uid, entry->lastError);
+  _queue.addLoaded(place, std::string(http::addressOf(entry->url)), entry->uid, entry->lastError);
   each(name, *entry);
 }
 
@@ -303,7 +304,7 @@ void PostSpool::begins(const Name& name) {
   if (const auto place = _queue.place(name.order)) _notes.again(*place);
 }
 
-// A post that has arrived and whose file outlives a kill comes again with the same ID.
+// If a kill leaves the file of a delivered post, the post is sent again with the same ID.
 void PostSpool::tried(const support::SpoolEntry& post, const http::HTTPResult& result) {
   const Name name{post.order, post.id};
   const int tries = post.tries + triesOf(result);

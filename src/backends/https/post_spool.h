@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The spool: keeps posts that failed on disk, and counts what becomes of them. Any thread; files are written
-// by the disk writer's thread.
+// The spool: keeps failed posts on disk, and counts their results. Any thread; files are written by the disk
+// writer's thread.
 #pragma once
 
 #include <chrono>
@@ -12,8 +12,8 @@
 #include <vector>
 
 #include "backends/https/spool_backlog.h"
-#include "backends/https/spool_notes.h"
 #include "backends/https/spool_queue.h"
+#include "backends/https/spool_recorder.h"
 #include "backends/https/spool_removals.h"
 #include "backends/https/spool_rules.h"
 #include "backends/https/spool_sections.h"
@@ -32,7 +32,7 @@ class Counters;
 
 namespace veltrad::backends {
 
-// A post on its way, which becomes a file if it fails.
+// An open post, which becomes a file if it fails.
 struct SpooledPost {
   support::SpoolEntry entry;
   // Pays for it until it is on disk or has ended.
@@ -43,7 +43,7 @@ struct SpooledPost {
   std::uint64_t emptied = 0;
 };
 
-// "spool" in settings.json, and where it lies.
+// "spool" in settings.json, and its directory.
 struct SpoolSettings {
   std::string directory;
   support::SpoolBounds bounds;
@@ -61,60 +61,60 @@ struct SpoolServices {
   platform::FateRing* fates = nullptr;
 };
 
-// Its 15 fields are the services, the parts of the spool, and who is told.
+// Its 15 fields are the services, the parts of the spool, and the waker.
 class PostSpool {
  public:
   using Name = support::SpoolFolder::Name;
   using Deadline = std::chrono::steady_clock::time_point;
 
-  // What it takes outlives it.
+  // The constructor's arguments must outlive it.
   PostSpool(const SpoolServices& services, SpoolSettings settings);
 
   // New posts: on a session's thread, and on the HTTP thread when they have ended.
 
-  // Numbers the post. Why it has to be kept without being sent, as one line; nothing: it is under way until
-  // ended().
+  // Numbers the post. Returns why it must be kept without being sent, as one line; absent if it may be sent,
+  // until ended().
   std::optional<std::string> admit(SpooledPost& post);
-  // If it has ended so that it is kept, that is done soon.
+  // Ends an open post; keeps it soon if the result requires that.
   void ended(const std::shared_ptr<SpooledPost>& post, const http::HTTPResult& result);
   // Keeps a post that was not admitted.
   void keep(const std::shared_ptr<SpooledPost>& post);
 
-  // The sender's thread, where nothing else is said.
+  // The sender's thread, unless stated otherwise.
 
-  // Has what an earlier daemon has left looked at, unless that was done. Any thread; first called before any
-  // post can be kept.
+  // Lists the files of an earlier daemon, unless that was done. Any thread; first called before any post can
+  // be kept.
   void list();
-  // Reads some of it, and gives each post that is kept to `each`. Returns the seconds until there may be more
-  // to read; nothing: all was read.
+  // Reads some of these files, and passes each kept post to `each`. Returns the seconds until there may be
+  // more to read; absent if all were read.
   using Each = std::function<void(const Name& name, const support::SpoolEntry& post)>;
   std::optional<double> loadSome(const Each& each);
-  // The same for what could not be read then.
+  // The same for files that could not be read then.
   void readAgain(const Each& each);
-  // The post as it lies there. Any thread.
+  // Reads the post's file. Any thread.
   support::SpoolFolder::Read read(const Name& name) const { return _folder.read(name); }
-  // Whether the post may leave by what is known of its storebag. Any thread.
+  // Whether the post may leave, by the known section of its storebag. Any thread.
   LeaveVerdict verdict(const support::SpoolEntry& post, const std::optional<ClientFacts>& facts) const;
-  // The same, but that it waits while its storebag is being fetched, which this may begin.
+  // The same, but the post waits while its storebag is fetched; may start the fetch.
   LeaveVerdict verdictBeforeTry(const support::SpoolEntry& post, const std::optional<ClientFacts>& facts);
-  // A try begins; it has ended so, and the file is removed, or is told how often the post was tried.
+  // A try begins; a try has ended, and the file is removed or updated with the number of tries.
   void begins(const Name& name);
   void tried(const support::SpoolEntry& post, const http::HTTPResult& result);
-  // Of a post that was dropped after so many tries; without any there is no record.
+  // Records a post that was dropped after so many tries; without a try there is no record.
   void recordUnsent(const support::SpoolEntry& post, int tries) const;
   void dropExpired();
 
   // Removes a post and counts its events. False: it is gone. `post`: where it is at hand.
   bool drop(const Name& name, wire::Reason reason, const support::SpoolEntry* post = nullptr);
-  // Removes all, also what was not read yet and what is being written, and drops what is under way if it
-  // fails. Returns how many posts.
+  // Removes all posts, also those not read yet and those being written, and drops open posts if they fail.
+  // Returns the number of posts.
   std::size_t empty(wire::Reason reason, Deadline deadline);
-  // All of it leaves now, but for the pace. Returns how many posts that are.
+  // Makes all posts due now, limited only by the pace. Returns the number of posts.
   std::size_t sendNow();
   // Waits until all that was kept is on disk. False if the deadline passed first.
   bool drain(Deadline deadline);
 
-  // Called whenever there may be something to send; null: nobody is.
+  // Sets the function that is called whenever there may be something to send; may be null.
   void setWaker(std::function<void()> waker);
 
   SpoolQueue& queue() { return _queue; }
@@ -136,7 +136,7 @@ class PostSpool {
   const platform::Clock& _clock;
   platform::Counters& _counters;
   SpoolRules _rules;
-  const SpoolNotes _notes;
+  const SpoolRecorder _notes;
   support::SpoolAge _age;
   const support::SpoolFolder _folder;
   SpoolRemovals _removals;
@@ -147,7 +147,7 @@ class PostSpool {
 
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   std::function<void()> _waker GUARDED_BY(_mutex);
-  // Why what is listed later is dropped: the spool was emptied before it was known what there is.
+  // Why files that are listed later are dropped: the spool was emptied before its files were listed.
   std::optional<wire::Reason> _unlisted GUARDED_BY(_mutex);
 
   // Last, because its destructor ends the writer's use of the others.

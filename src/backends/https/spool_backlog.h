@@ -18,18 +18,18 @@ class SpoolBacklog {
   using Name = support::SpoolFolder::Name;
   using Deadline = std::chrono::steady_clock::time_point;
 
-  // True: nobody lists the files yet, and the caller does, and says with listed() what there is, oldest
-  // first; nothing: it cannot be told just now, so that somebody has to list them again.
+  // True if the files are not listed yet; the caller then lists them and passes them to listed(), oldest
+  // first, or nothing if they cannot be listed at the moment.
   bool isToBeListed();
   void listed(std::optional<std::vector<Name>> names);
-  // All have been listed and read.
+  // True if all files have been listed and read.
   bool isDone() const;
-  // The next to be read; nothing: there is none now. It is the reader's until it calls wasRead(), with false
-  // if it has to be read again.
+  // The next file to read; absent if there is none now. The reader owns it until it calls wasRead(), with
+  // false if the file must be read again.
   std::optional<Name> next();
   void wasRead(bool done);
-  // All that has not been read, which is the caller's from then on. Waits for what is being listed and read.
-  // Nothing: it is not known what there is, or the deadline passed first.
+  // Takes all files that were not read yet. Waits until listing and reading have ended. Absent if the files
+  // are not listed, or the deadline passed first.
   std::optional<std::vector<Name>> takeAll(Deadline deadline);
 
  private:

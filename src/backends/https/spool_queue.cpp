@@ -20,7 +20,7 @@ double steadyNow() {
   return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
 }
 
-// Of posts that could not be read yet.
+// The address of posts that could not be read yet.
 constexpr const char* kNoAddress = "";
 constexpr std::uint32_t kNoUser = 0xffff'ffff;
 
@@ -211,7 +211,7 @@ std::vector<SpoolQueue::Name> SpoolQueue::takeDue(double& next) {
     SpoolWait& wait = _waits[address];
     if (_index.postsAt(address) == 0) continue;
     if (wait.next() <= now) {
-      // One that is blocked, or under way, asks again when it ends.
+      // An address whose posts are blocked or open asks again when a post ends.
       Place* place = _index.next(address, wait.failing(), isBlocked);
       if (!place) continue;
       place->state = State::sending;

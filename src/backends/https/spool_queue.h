@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which posts are in the spool, which of them may leave when, and which have to queue behind them. No disk;
-// any thread.
+// The queue of the spool: its posts, when each may leave, and which new posts must wait behind them. Does no
+// disk work; any thread.
 #pragma once
 
 #include <chrono>
@@ -21,8 +21,7 @@ class Clock;
 
 namespace veltrad::backends {
 
-// Of what is asked for an address. Its 11 fields are the places, the addresses, the posts under way and how
-// the spool stands.
+// Its 11 fields are the places, the addresses, the open posts and the state of the spool.
 class SpoolQueue {
  public:
   using Name = support::SpoolFolder::Name;
@@ -38,26 +37,26 @@ class SpoolQueue {
   struct Admission {
     std::uint64_t order = 0;
     std::uint64_t emptied = 0;  // how often the queue had been emptied
-    // Why it is to be kept at once, as one line; nothing: it may begin, and is under way until it has landed.
+    // Why it must be kept at once, as one line; absent if it may begin; it is open until landed().
     std::optional<std::string> refusal;
   };
 
-  // The clock outlives it.
+  // The clock must outlive it.
   SpoolQueue(const platform::Clock& clock, const support::SpoolBounds& bounds, const SpoolPace& pace)
       : _clock(clock), _pace(pace), _index(bounds) {}
 
   // While the spool is being read every post is refused.
   Admission admit(const std::string& address, std::uint32_t connection);
-  // It has ended, and the server has given an answer that is no reason to keep it; or there is no answer.
+  // An open post has ended and is not kept. `answered`: the server has given an answer.
   void landed(std::uint64_t order, const std::string& address, bool answered);
-  // It has ended so that it is kept, and tells of its server.
+  // An open post has ended and is kept, and its result concerns the server.
   void failed(const std::string& address, const http::HTTPResult& result);
   // Takes a place in state `writing`, so that later ones of its connection queue behind it. False: the queue
   // has been emptied since it was admitted.
   bool add(Place place, const std::string& address, std::uint32_t uid, std::uint64_t emptied);
-  // What an earlier daemon has left, also in the place of one that could not be read before.
+  // Adds a post of an earlier daemon, or replaces one that could not be read before.
   void addLoaded(Place place, const std::string& address, std::uint32_t uid, const std::string& lastError);
-  // One of these that cannot be read yet. It takes its bytes, and is not sent.
+  // Adds a post of an earlier daemon that cannot be read yet. Its bytes count, and it is not sent.
   void addUnread(const Name& name, std::uint32_t bytes);
   std::vector<Name> unread() const;
   void allLoaded();
@@ -72,25 +71,25 @@ class SpoolQueue {
   bool holds(std::uint64_t order) const;
   // As it was; nothing: it is not there.
   std::optional<Place> takeOut(std::uint64_t order);
-  // The one that has to go, while there is too much.
+  // The post to drop while a bound is exceeded.
   std::optional<Name> excess(support::SpoolIndex::Excess& why) const;
   // The oldest, if it was made before.
   std::optional<Name> olderThan(std::uint64_t order) const;
-  // Of the newest post that was ever made.
+  // The order of the newest post that was ever made.
   std::uint64_t lastOrder() const;
 
   // Posts that leave now. `next`: when to ask again, in seconds from now.
   std::vector<Name> takeDue(double& next);
-  // One of these has ended so. Returns it as it is now; nothing: it was taken out meanwhile. It is taken out
-  // if it is not kept.
+  // A due post has ended with this result. Returns its place; absent if it was taken out meanwhile. A post
+  // that is not kept is taken out.
   std::optional<Place> tried(std::uint64_t order, const http::HTTPResult& result);
-  // One of these was not tried, and its address waits for so many seconds.
+  // A due post was not tried, and its address waits for so many seconds.
   void putBack(std::uint64_t order, double seconds);
   // The network may be there again.
   void woken();
-  // All leave now, but for the pace. Returns how many posts that are.
+  // Makes all posts due now, limited only by the pace. Returns the number of posts.
   std::size_t hurry();
-  // What is under way is not kept when it fails. Returns the posts, which stay.
+  // Open posts are not kept if they fail. Returns the kept posts, which stay in the queue.
   std::vector<Name> empty();
   // Nothing leaves any more.
   void stopSending();

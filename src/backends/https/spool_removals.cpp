@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Remembers what is still there.
+// Remembers files that could not be removed.
 #include "backends/https/spool_removals.h"
 
 #include <utility>

@@ -20,12 +20,12 @@ class SpoolRemovals {
   using Name = support::SpoolFolder::Name;
   using Time = std::chrono::steady_clock::time_point;
 
-  // Both outlive it.
+  // Both must outlive it.
   SpoolRemovals(const support::SpoolFolder& folder, platform::Counters& counters)
       : _folder(folder), _counters(counters) {}
 
   void remove(const Name& name);
-  // Tries what is left, once a second at most. Returns whether there is anything.
+  // Tries the remaining files again, at most once a second. Returns whether there are any.
   bool tryAgain(Time now = std::chrono::steady_clock::now());
 
  private:

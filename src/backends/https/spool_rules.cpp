@@ -26,7 +26,7 @@ std::optional<ClientFacts> SpoolRules::facts() const {
                      std::move(device->productType), 0};
 }
 
-SpoolRules::Word SpoolRules::word(const Word& before) const {
+SpoolRules::OwnerState SpoolRules::ownerState(const OwnerState& before) const {
   return {_sources.gate.turn(), consent().value_or(before.consent)};
 }
 

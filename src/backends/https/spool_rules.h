@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks what decides whether a kept post may leave: the owner, the machine, and a section. Any thread.
+// Collects the facts that decide whether a kept post may leave: the owner's decision, the machine, and a
+// section. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -31,32 +32,32 @@ class SpoolRules {
     platform::Locale& locale;
     support::DeviceIdentity& device;
   };
-  // The sources outlive it.
+  // The sources must outlive it.
   explicit SpoolRules(const Sources& sources) : _sources(sources) {}
 
-  // What the machine says, for as many posts as are asked for at once; nothing: it cannot be read just now.
+  // The facts of the machine, for a group of posts; absent if they cannot be read at the moment.
   std::optional<ClientFacts> facts() const;
-  // As in spool_verdicts.h, by the owner's word of now.
+  // As in spool_verdicts.h, with the owner's current decision.
   LeaveVerdict verdict(const support::SpoolEntry& post, const config::StorebagSection* section,
                        const std::optional<ClientFacts>& facts) const {
-    return verdictOnLeaving(post, *_sources.gate.word(), section, facts);
+    return verdictOnLeaving(post, *_sources.gate.decision(), section, facts);
   }
   std::optional<wire::Reason> ownersRefusal(const support::SpoolEntry& post) const {
-    return refusalByOwner(post, *_sources.gate.word());
+    return refusalByOwner(post, *_sources.gate.decision());
   }
   // Why nothing may leave.
-  std::optional<wire::Reason> refusalOfAll() const { return _sources.gate.word()->refusal; }
+  std::optional<wire::Reason> refusalOfAll() const { return _sources.gate.decision()->refusal; }
 
-  // What the owner says; changes with the policy and the consent. A shortage is no change.
-  struct Word {
+  // The owner's decision; changes with the policy and the consent, not during a shortage.
+  struct OwnerState {
     std::uint64_t turn = 0;
     bool consent = false;
-    bool operator==(const Word&) const = default;
+    bool operator==(const OwnerState&) const = default;
   };
-  Word word(const Word& before) const;
+  OwnerState ownerState(const OwnerState& before) const;
 
  private:
-  // Nothing: it cannot be read just now.
+  // Absent if it cannot be read at the moment.
   std::optional<bool> consent() const;
 
   const Sources _sources;

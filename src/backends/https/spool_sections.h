@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What storebags say of kept posts. A storebag is fetched on a thread of its own, so that neither a try nor a
-// withdrawal waits for a server. Any thread.
+// The storebag sections of kept posts. Storebags are fetched on a separate thread, so that neither a try nor
+// a withdrawal of consent waits for a server. Any thread.
 #pragma once
 
 #include <chrono>
@@ -26,17 +26,17 @@ class SectionSource {
 class SpoolSections {
  public:
   using Time = std::chrono::steady_clock::time_point;
-  // Each question may be a log line, where a storebag cannot be had.
+  // The minimum time between fetches, because each failed one is logged.
   static constexpr std::chrono::seconds kApart{30};
 
   ~SpoolSections() { stop(); }
 
-  // Before another thread asks. `source` outlives it; `ended` is called when a fetch has ended.
+  // Before another thread asks. `source` must outlive it; `ended` is called when a fetch has ended.
   void setSource(SectionSource& source, std::function<void()> ended);
   // Null: none is known.
   std::shared_ptr<const config::StorebagSection> known(std::int32_t clientType) const;
-  // Has the storebag fetched unless that was asked for a moment ago. True while it is being fetched, and if
-  // that cannot be begun for want of a thread. One thread asks.
+  // Fetches the storebag unless that was done recently. True while it is being fetched, or if no thread could
+  // be started for it. Used by one thread.
   bool isAwaited(std::int32_t clientType, Time now = std::chrono::steady_clock::now());
   // Grows when a client type's first fetch has ended, and when one has brought another section.
   std::uint64_t turn() const;

@@ -19,7 +19,7 @@ namespace veltrad::backends {
 
 namespace {
 
-// How often the owner's word and the age of posts are looked at while the spool holds anything.
+// How often the owner's decision and the age of posts are checked while the spool is not empty.
 constexpr double kLook = 0.3;
 constexpr double kIdle = 3600;
 // Until a post is tried again whose file or facts cannot be read, or whose storebag is being fetched.
@@ -27,7 +27,7 @@ constexpr double kUntilDecided = 0.1;
 // Between two attempts at all that could not be read, or decided on.
 constexpr std::chrono::seconds kApart{1};
 constexpr std::size_t kStackBytes = 256u << 10;
-// Names that are taken out of the queue at once.
+// The number of names that are taken out of the queue at once.
 constexpr std::size_t kSome = 256;
 
 http::HTTPRequest requestOf(const std::shared_ptr<const support::SpoolEntry>& post) {
@@ -77,12 +77,11 @@ void SpoolSender::stop() {
 }
 
 void SpoolSender::wake() {
-  const std::uint64_t one = 1;
-  if (::write(_news.get(), &one, sizeof one) < 0) return;  // it is awake
+  ::eventfd_write(_news.get(), 1);  // fails only if it is awake
 }
 
 void SpoolSender::run() {
-  _word = _spool.rules().word({});
+  _owner = _spool.rules().ownerState({});
   while (!_stops) {
     double next = kLook;
     try {
@@ -131,14 +130,14 @@ double SpoolSender::load() {
 }
 
 void SpoolSender::askAgain() {
-  const SpoolRules::Word word = _spool.rules().word(_word);
+  const SpoolRules::OwnerState owner = _spool.rules().ownerState(_owner);
   const std::uint64_t sections = _spool.sections().turn();
   const auto now = std::chrono::steady_clock::now();
   const bool again = _undecided && _undecidedAgain <= now;
-  if (word == _word && sections == _sections && !again) return;
+  if (owner == _owner && sections == _sections && !again) return;
   // Consent that is withdrawn does not wait for a storebag that might override it.
-  const bool withdrawn = _word.consent && !word.consent;
-  _word = word;
+  const bool withdrawn = _owner.consent && !owner.consent;
+  _owner = owner;
   _sections = sections;
   _facts = _spool.rules().facts();
   _undecidedAgain = now + kApart;
@@ -152,7 +151,7 @@ bool SpoolSender::askForAll(bool withoutWaiting) {
   std::uint64_t after = 0;
   for (auto names = _spool.queue().names(after, kSome); !names.empty() && !_stops;
        names = _spool.queue().names(after, kSome)) {
-    if (_spool.rules().word(_word) != _word) return false;  // all begins again
+    if (_spool.rules().ownerState(_owner) != _owner) return false;  // all begins again
     for (const PostSpool::Name& name : names) {
       after = name.order;
       if (all) {
@@ -239,8 +238,8 @@ void SpoolSender::wait(double seconds) {
   const double whole = std::floor(std::max(0.0, seconds));
   const timespec most{static_cast<time_t>(whole), static_cast<long>((std::max(0.0, seconds) - whole) * 1e9)};
   ::ppoll(events.data(), events.size(), &most, nullptr);
-  std::uint64_t count = 0;
-  if (::read(_news.get(), &count, sizeof count) < 0) return;  // the time is over
+  eventfd_t count = 0;
+  ::eventfd_read(_news.get(), &count);  // fails if the time is over
 }
 
 }  // namespace veltrad::backends

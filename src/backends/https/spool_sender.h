@@ -1,6 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Sends the posts of the spool again: a thread that reads what lies there, asks whether it may leave, and
-// waits.
+// Sends the posts of the spool again: a thread that reads them, checks whether they may leave, and waits.
 #pragma once
 
 #include <atomic>
@@ -12,22 +11,22 @@
 #include "backends/https/post_spool.h"
 #include "base/file_descriptor.h"
 #include "base/thread.h"
-#include "platform/wake_watch.h"
+#include "platform/network_watch.h"
 
 namespace veltrad::backends {
 
-// Its 15 fields are the thread, and what it remembers from one turn to the next. A turn that finds no memory
-// is followed by another one.
+// Its 15 fields are the thread and its state between two turns. A turn that fails for lack of memory is
+// repeated.
 class SpoolSender {
  public:
-  // All outlive it. What an earlier daemon has left is looked at from then on.
+  // All must outlive it. Lists the posts of an earlier daemon.
   SpoolSender(PostSpool& spool, http::HTTPClient& http, SectionSource& sections);
   ~SpoolSender() { stop(); }
 
-  // Reads the spool and sends from then on. False if there is no thread or descriptor just now; to be called
-  // again.
+  // Reads the spool and sends from then on. False if there is no thread or descriptor at the moment; to be
+  // called again.
   bool start();
-  // Nothing more is sent after it has returned. Called again, it settles what has ended since.
+  // Nothing is sent after it has returned. A further call settles the posts that have ended since.
   void stop();
 
  private:
@@ -44,11 +43,11 @@ class SpoolSender {
   double turn();
   // Reads what an earlier daemon has left. Returns the seconds until there is more to read.
   double load();
-  // Asks for all posts, if the owner's word or a storebag has changed, or some could not be decided on.
+  // Checks all posts again if the owner's decision or a storebag has changed, or if some were undecided.
   void askAgain();
-  // False: some could not be decided on.
+  // False if some posts remain undecided.
   bool askForAll(bool withoutWaiting);
-  // Drops the post if it may not leave. False: that cannot be told just now.
+  // Drops the post if it may not leave. False if this is undecided.
   bool ask(const PostSpool::Name& name, const support::SpoolEntry& post, bool withoutWaiting);
   void send(const PostSpool::Name& name);
   void begin(const PostSpool::Name& name);
@@ -64,8 +63,8 @@ class SpoolSender {
   Thread _thread;
 
   // The thread only.
-  platform::WakeWatch _watch;
-  SpoolRules::Word _word;
+  platform::NetworkWatch _watch;
+  SpoolRules::OwnerState _owner;
   std::uint64_t _sections = 0;        // SpoolSections::turn() of the last time that all were asked for
   std::optional<ClientFacts> _facts;  // as just read
   bool _undecided = false;            // some could not be decided on

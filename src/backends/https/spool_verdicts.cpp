@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the owner's word, the section and its client entry, in this order.
+// Checks the owner's decision, the section and its client entry, in this order.
 #include "backends/https/spool_verdicts.h"
 
 #include <fmt/format.h>
@@ -42,8 +42,8 @@ int triesOf(const http::HTTPResult& result) {
   return error.begun && error.refusal != Reason::over_daily_limit ? std::max(1, error.transmissions) : 0;
 }
 
-std::optional<Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnersWord& word) {
-  return word.refusalFor(post.text("backend"), {http::hostName(post.url)});
+std::optional<Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnerDecision& decision) {
+  return decision.refusalFor(post.text("backend"), {http::hostName(post.url)});
 }
 
 namespace {
@@ -67,10 +67,10 @@ std::optional<Reason> refusalByEntry(const support::SpoolEntry& post, const conf
 }
 }  // namespace
 
-LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnersWord& word,
+LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnerDecision& decision,
                               const config::StorebagSection* section,
                               const std::optional<ClientFacts>& facts) {
-  if (const auto refused = refusalByOwner(post, word)) return {refused, false};
+  if (const auto refused = refusalByOwner(post, decision)) return {refused, false};
   if (!post.asksEntry) return {};
   if (!facts) return {std::nullopt, true};
   return {refusalByEntry(post, section, *facts), false};

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether a post that has ended so is kept in the spool, and whether a kept one may still leave. Values to
-// verdicts; any thread.
+// Decides whether a failed post is kept in the spool, and whether a kept post may still leave. Pure
+// functions; any thread.
 #pragma once
 
 #include <optional>
@@ -12,7 +12,7 @@
 #include "wire/reasons.h"
 
 namespace veltrad::config {
-struct OwnersWord;
+struct OwnerDecision;
 }  // namespace veltrad::config
 
 namespace veltrad::support {
@@ -21,11 +21,11 @@ struct SpoolEntry;
 
 namespace veltrad::backends {
 
-// After a transport error, too many posts under way, a stop, 408, 425, 429, and 5xx but for 501 and 505.
+// True after a transport error, too many open posts, a stop, 408, 425, 429, and 5xx except for 501 and 505.
 bool isToBeKept(const http::HTTPResult& result);
 // "HTTP 503", or the transport's text.
 std::string outcomeOf(const http::HTTPResult& result);
-// Whether it says anything of the server: what this end could not begin, or gave up, does not.
+// Whether the result concerns the server: a request that failed on this side does not.
 bool tellsOfServer(const http::HTTPResult& result);
 // How often the post was tried, with libcurl's own repeats on a kept connection. One that found no server was
 // tried, too; one that the day's limit refused was not.
@@ -35,22 +35,23 @@ int triesOf(const http::HTTPResult& result);
 struct LeaveVerdict {
   // Why it may not.
   std::optional<wire::Reason> refusal;
-  // It cannot be told just now, and the post waits.
+  // Undecided at the moment, so the post waits.
   bool waits = false;
 
   bool mayLeave() const { return !refusal && !waits; }
 };
 
-// The owner's word stands above all.
-std::optional<wire::Reason> refusalByOwner(const support::SpoolEntry& post, const config::OwnersWord& word);
-// Then decides the client entry of the section that is in force, or, without a section (null), consent.
-// Sampling is not drawn anew, and of `facts` the factor is not used. Without `facts`, which cannot be read
-// just now, a post waits if they decide.
-LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnersWord& word,
+// The owner's decision comes first.
+std::optional<wire::Reason> refusalByOwner(const support::SpoolEntry& post,
+                                           const config::OwnerDecision& decision);
+// Then the client entry in the current section decides, or consent without a section (null). Sampling is not
+// drawn again: the factor in `facts` is not used. `facts` may be null if they cannot be read at the moment; a
+// post that depends on them waits.
+LeaveVerdict verdictOnLeaving(const support::SpoolEntry& post, const config::OwnerDecision& decision,
                               const config::StorebagSection* section,
                               const std::optional<ClientFacts>& facts);
 
-// Under which an event is counted that leaves the spool unsent for this reason.
+// The reason under which an event is counted that is dropped from the spool for `why`.
 wire::Reason countedFromSpool(wire::Reason why);
 
 }  // namespace veltrad::backends

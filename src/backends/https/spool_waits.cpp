@@ -35,7 +35,7 @@ void SpoolWait::emptied() {
   _nextTry = 0;
 }
 
-// What was late is caught up with, so that the pace is kept; what was not used is gone.
+// Late posts are caught up, so that the pace is kept on average; unused time is not saved.
 void SpoolWait::left(double now) {
   const double apart = 1 / _pace->postsPerSecond;
   _nextLeave = now - _nextLeave < apart ? _nextLeave + apart : now + apart;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// When one address of the spool is tried again. Values in, times out: all are seconds of one clock, and the
-// caller gives the draws. The owner guards it.
+// Computes when an address of the spool is tried again. All times are seconds of one clock, and the caller
+// supplies the random numbers. The owner guards it.
 #pragma once
 
 #include <string>
@@ -15,7 +15,7 @@ struct SpoolPace {
 
 class SpoolWait {
  public:
-  // The pace outlives it.
+  // The pace must outlive it.
   explicit SpoolWait(const SpoolPace& pace) : _pace(&pace), _wait(pace.firstWait) {}
 
   // From a failure until a success the oldest post alone is tried, and new ones are kept.
@@ -24,20 +24,20 @@ class SpoolWait {
   bool refuses(double now) const { return _failing || now < _retryUntil; }
   // When the next post may leave.
   double next() const;
-  // The same but for the pace, as people are told; 0: now.
+  // The same without the pace, for people; 0 means now.
   double nextTry() const;
   const std::string& lastError() const { return _lastError; }
 
   // A post has failed. `wasTry`: it was one of the spool, so that the wait doubles. `retryAfter`: what the
   // server asks for; 0: nothing. `draw`: in [0, 1).
   void failed(double now, bool wasTry, double retryAfter, double draw, std::string error);
-  // The server has answered, and not so that the post is kept.
+  // The server has given an answer for which the post is not kept.
   void succeeded();
   // A post has been begun.
   void left(double now);
-  // None leaves before then, whatever the server does: this end cannot send just now.
+  // No post leaves before then, because this side cannot send at the moment.
   void postponed(double until);
-  // No post is left. What the server asks for stays.
+  // No post is left. A wait that the server has asked for stays.
   void emptied();
   // A route has come, or the machine has woken.
   void woken(double now, double draw);

@@ -12,7 +12,7 @@
 namespace veltrad::backends {
 
 // A tree of the structures of veltra/adaptor.h. It refers to the dictionary's texts and data, so the
-// dictionary outlives it.
+// dictionary must outlive it.
 class AdaptorPayload {
  public:
   explicit AdaptorPayload(const Dictionary* payload);

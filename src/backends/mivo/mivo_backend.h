@@ -14,7 +14,7 @@
 namespace veltrad::backends {
 
 // If the bundle or its class is missing, the back end has no adaptor and logs an error for each message. The
-// bundle outlives it.
+// bundle must outlive it.
 class MivoBackend final : public VeltraBackend {
  public:
   // Null, after one error line, if the client type has no adaptor.

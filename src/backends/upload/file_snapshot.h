@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A file in the state at the beginning of its upload, read through a descriptor.
+// Reads a lent file through its descriptor, up to the size at the beginning of the upload.
 #pragma once
 
 #include <sys/stat.h>
@@ -16,7 +16,7 @@ class FileSnapshot {
   // 2 GiB - 1, the limit of zlib and of system calls.
   static constexpr off_t kMostBytes = 0x7fffffff;
 
-  // Nothing if it is not a regular file. The descriptor stays the caller's and outlives this object.
+  // Nothing if it is not a regular file. The descriptor stays the caller's and must outlive this object.
   static std::optional<FileSnapshot> of(int descriptor);
 
   off_t size() const { return _size; }

@@ -25,7 +25,7 @@ class FileUploads {
   // All clients without an account count as one user.
   using User = std::optional<unsigned>;
 
-  // Whose files wait for a place or are being compressed.
+  // The clients whose files wait for a place or are being compressed.
   using Preparing = std::list<std::shared_ptr<const Dictionary>>;
   Preparing preparing() {
     const Lock held(_mutex);

@@ -18,7 +18,7 @@ namespace veltrad::backends {
 class CompressedFile;
 class FileUploads;
 
-// What an upload back end uses. The references outlive it.
+// What an upload back end uses. The references must outlive it.
 struct UploadMaking {
   platform::Random& random;
   FileUploads& uploads;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// One child and one pipe.
+// Runs one child process with one pipe.
 #include "tools/ctl/child_output.h"
 
 #include <fcntl.h>

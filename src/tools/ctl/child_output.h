@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What another program prints. One thread.
+// Runs another program and returns its output. One thread.
 #pragma once
 
 #include <chrono>

@@ -18,7 +18,8 @@ std::uint64_t unsignedNumber(const Dictionary& answer, const char* key) {
 }  // namespace
 
 Result<Done, std::string> ContentsSource::readOn() {
-  // What comes meanwhile is left for the next call, or a busy daemon would keep this one from ending.
+  // Contents that arrive meanwhile are left for the next call; otherwise a busy daemon could keep this call
+  // from ending.
   for (std::optional<std::uint64_t> end; !end || *_next < *end;) {
     Dictionary arguments;
     if (_next) arguments.set("from", *_next);

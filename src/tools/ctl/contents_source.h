@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the daemon what messages hold. One thread.
+// Reads the contents of messages from the daemon. One thread.
 #pragma once
 
 #include <cstdint>
@@ -13,7 +13,7 @@
 
 namespace veltrad::ctl {
 
-// The daemon keeps what messages hold from the first call of readOn() until the client's connection ends.
+// The daemon keeps the contents of messages from the first call of readOn() until the connection ends.
 class ContentsSource {
  public:
   // Outlives it.
@@ -21,12 +21,12 @@ class ContentsSource {
 
   // Reads what has come since the last call. The error is one line.
   Result<Done, std::string> readOn();
-  // "payload" and "userInfo" of a message that the record tells of, once; nothing if they are lost. Reads on
-  // where necessary.
+  // "payload" and "userInfo" of a message of the record, once; absent if they are lost. Reads further
+  // contents if necessary.
   Result<std::optional<Dictionary>, std::string> of(std::uint64_t message);
 
  private:
-  // Of messages that nobody has asked for yet; those with the lowest numbers make room.
+  // The bound for contents that were not asked for yet; those with the lowest numbers are dropped first.
   static constexpr std::size_t kMostBytes = 8u << 20;
   // Sessions send at the same time, so that the order of numbers is nearly that of arrival.
   static constexpr std::uint64_t kDisorder = 4096;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// One call at a time, and its reply.
+// Sends one call at a time and waits for its reply.
 #include "tools/ctl/control_client.h"
 
 #include <fmt/format.h>

@@ -39,7 +39,7 @@ Array withoutDaemon(const std::string& why) {
   return checks;
 }
 
-// What a client like this one is told.
+// The result of connecting as a client.
 Value tryAsClient(const Options& options) {
   const auto daemon = client::reachDaemon(
       wire::socketPathUnder(options.root ? *options.root : wire::rootFromEnvironment()), "");

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Compares a message with what was asked for.
+// Compares a message with the filter.
 #include "tools/ctl/fate_filter.h"
 
 #include "support/fate_reader.h"

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which messages `veltractl why` and `watch` tell of. A pure function.
+// Selects the messages that `veltractl why` and `watch` show. Pure functions.
 #pragma once
 
 #include <cstdint>
@@ -12,7 +12,7 @@ struct ToldMessage;
 
 namespace veltrad::ctl {
 
-// What is absent fits every message; texts and numbers must be equal.
+// Absent values match every message; texts and numbers must be equal.
 struct FateFilter {
   std::optional<std::uint64_t> message;
   std::optional<std::int32_t> clientType;
@@ -27,7 +27,7 @@ struct FateFilter {
   bool uploads = false;                // files and log data instead of messages
 };
 
-// All but the back end.
+// Compares everything except the back end.
 bool fits(const FateFilter& filter, const support::ToldMessage& message);
 
 }  // namespace veltrad::ctl

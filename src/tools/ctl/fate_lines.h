@@ -1,13 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
-// What became of messages, for programs. Pure functions.
+// The fates of messages as JSON, for programs. Pure functions.
 #pragma once
 
-#include "base/value.h"
+#include "base/null_value.h"
 #include "support/fate_book.h"
 
 namespace veltrad::ctl {
 
-// What is known of a message itself; null stands for what is not.
+// The data of a message itself; unknown values are null.
 Dictionary lineOfMessage(const support::ToldMessage& message);
 // The same with its back ends and their roads.
 Dictionary lineOfFates(const support::MessageFates& fates);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which messages are asked for.
+// The options that select messages.
 #include "tools/ctl/command_options.h"
 
 #include <CLI/CLI.hpp>

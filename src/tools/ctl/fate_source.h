@@ -14,16 +14,16 @@ namespace veltrad::ctl {
 
 class FateSource {
  public:
-  // Both outlive it.
+  // Both must outlive it.
   FateSource(ControlClient& daemon, support::FateReader::Listener& listener)
       : _daemon(daemon), _listener(listener) {}
 
-  // Reads what has been written since the last call. If not `patient`, passes over what is being written just
-  // now. The error is one line.
+  // Reads what has been written since the last call. If not `patient`, passes over what is being written at
+  // the moment. The error is one line.
   Result<Done, std::string> readOn(bool patient);
   // The last call has stopped at something that was not written yet.
   bool waits() const { return _waits; }
-  // Of messages at earlier positions something is missing.
+  // The data of messages before this position is incomplete.
   std::uint64_t horizon() const { return _horizon; }
   // How many messages the daemon had taken in before the last call.
   std::uint64_t messages() const { return _messages; }

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Says in plain words what became of messages.
+// Writes the fates of messages as readable text.
 #include "tools/ctl/fate_text.h"
 
 #include <fmt/format.h>
@@ -89,7 +89,7 @@ std::string keptText(const support::BackendFate& fate) {
          (wait > 0 ? "in " + formatDuration(wait) : "at its turn");
 }
 
-// Where it is now.
+// The current state of the message.
 std::string endOf(const support::BackendFate& fate) {
   using wire::Fate;
   switch (fate.fate) {

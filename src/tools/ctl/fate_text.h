@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What became of messages, for people. Pure functions.
+// The fates of messages as readable text. Pure functions.
 #pragma once
 
 #include <string>
@@ -14,7 +14,7 @@ std::string textOfFates(const support::MessageFates& fates);
 std::string textOfMessage(const support::ToldMessage& message);
 // "10:04:05.123 httppost: posted to …"; `backend` may be empty.
 std::string textOfStep(const support::ToldStep& step, std::string_view backend);
-// In the time zone of who reads.
+// In the local time zone.
 std::string timeOf(std::int64_t microseconds);
 
 }  // namespace veltrad::ctl

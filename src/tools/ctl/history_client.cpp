@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks for page after page, and joins the two records of what left.
+// Requests all pages, and joins the two records of each departure.
 #include "tools/ctl/history_client.h"
 
 #include <map>

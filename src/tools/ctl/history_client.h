@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The history of what left, as the daemon tells it. One thread.
+// Reads the history from the daemon. One thread.
 #pragma once
 
 #include <optional>
@@ -12,13 +12,13 @@
 
 namespace veltrad::ctl {
 
-// What left, with how it ended. `facts` is the line for programs.
+// A departure with its result. `facts` is the JSON line for programs.
 struct HistoryItem {
   Dictionary facts;
   Array headers;         // lines
   Value day = false;     // a text; where its first record stands
   Value offset = false;  // an integer
-  // Of a body that was too large to be kept.
+  // The digest of a body that was too large to be kept.
   std::optional<std::string> digest;
 
   // A text of `facts`; empty: there is none.

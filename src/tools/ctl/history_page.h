@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What left, as a page for a browser. One thread.
+// Writes the history as an HTML page. One thread.
 #pragma once
 
 #include <functional>

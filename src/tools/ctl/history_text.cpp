@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts what is known of a departure into words.
+// Describes a departure in readable text.
 #include "tools/ctl/history_text.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What left, in plain words. Pure functions; any thread.
+// Describes departures in readable text. Pure functions; any thread.
 #pragma once
 
 #include <string>
@@ -20,11 +20,11 @@ std::string outcomeOf(const HistoryItem& item);
 std::string whatOf(const HistoryItem& item);
 // "phone/ringer", or the client type without names.
 std::string whoseOf(const HistoryItem& item);
-// What else is known of it, by name, in words.
+// The other details of it, by name, as readable text.
 std::vector<std::pair<std::string, std::string>> detailsOf(const HistoryItem& item);
-// All that is known of it, and its header lines.
+// All details of it, and its header lines.
 std::string headOfItem(const HistoryItem& item);
-// Of an item whose body was not kept.
+// The text for an item whose body was not kept.
 std::string withoutBody(const HistoryItem& item);
 
 }  // namespace veltrad::ctl

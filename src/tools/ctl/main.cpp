@@ -16,14 +16,7 @@ int ask(const Options& options, Run run) {
   return daemon ? run(daemon.value(), options) : refused(daemon.error());
 }
 
-int run(int argc, char** argv) {
-  const auto parsed = parseOptions(argc, argv);
-  if (const auto* ending = std::get_if<Ending>(&parsed)) {
-    std::fputs(ending->output.c_str(), stdout);
-    std::fputs(ending->errorOutput.c_str(), stderr);
-    return ending->status;
-  }
-  const Options& options = std::get<Options>(parsed);
+int runCommand(const Options& options) {
   Interrupt interrupt;
   switch (options.command) {
     case Command::stats:
@@ -67,6 +60,15 @@ int run(int argc, char** argv) {
     default:
       return runOneCall(options, interrupt);
   }
+}
+
+int run(int argc, char** argv) {
+  const auto parsed = parseOptions(argc, argv);
+  if (const auto* options = std::get_if<Options>(&parsed)) return runCommand(*options);
+  const Ending& ending = std::get<Ending>(parsed);
+  std::fputs(ending.output.c_str(), stdout);
+  std::fputs(ending.errorOutput.c_str(), stderr);
+  return ending.status;
 }
 
 }  // namespace

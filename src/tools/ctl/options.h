@@ -60,7 +60,7 @@ enum class Command {
   watch
 };
 
-// Of the commands for those who look after a device.
+// Options of the commands for administrators.
 struct Care {
   bool watch = false;
   // doctor.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the daemon; takes its place where there is none.
+// Asks the daemon, or accesses the files if no daemon runs.
 #include "tools/ctl/preference_access.h"
 
 #include <fmt/format.h>
@@ -76,7 +76,7 @@ Result<PreferenceAccess, std::string> PreferenceAccess::open(const std::optional
   }
   const auto root = where ? platform::Root(*where) : platform::Root::fromEnvironment();
   access._files = std::make_unique<Files>(root);
-  // Where there has never been a daemon, there is nothing to hold, and who only reads makes nothing.
+  // If no daemon has ever run, there is no lock to take, and reading creates no file.
   if (use == Use::read && isMissing(root.lockPath())) return access;
   auto lock = takeLock(root, daemon.error());
   if (!lock) return Failure{lock.error()};

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Where veltractl reads and changes preferences: the daemon, or their files while none runs. One thread.
+// Reads and changes preferences through the daemon, or in their files while no daemon runs. One thread.
 #pragma once
 
 #include <memory>
@@ -15,7 +15,7 @@ namespace veltrad::ctl {
 class PreferenceAccess {
  public:
   enum class Use { read, change };
-  // The daemon's lock is held from here on where no daemon runs. The error is one line that says what to do.
+  // If no daemon runs, the daemon's lock is held from here on. The error is one line that says what to do.
   static Result<PreferenceAccess, std::string> open(const std::optional<std::string>& root, Use use);
   PreferenceAccess(PreferenceAccess&&) noexcept;
   ~PreferenceAccess();

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Unpacks and lays out.
+// Unpacks and formats bodies.
 #include "tools/ctl/readable_body.h"
 
 #include <fmt/format.h>

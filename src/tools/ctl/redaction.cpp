@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Line by line, by patterns; private keys before, as they go over lines.
+// Redacts line by line with patterns, after removing private keys, which span lines.
 #include "tools/ctl/redaction.h"
 
 #include <pwd.h>
@@ -33,7 +33,7 @@ std::regex pattern(const std::string& text) {
   return std::regex(text, std::regex::ECMAScript | std::regex::icase | std::regex::optimize);
 }
 
-// In this order: a URL is read before what stands in it.
+// In this order: a URL is matched before its parts.
 const std::vector<Pattern>& patterns() {
   static const std::vector<Pattern> kPatterns = {
       {pattern("([a-z][a-z0-9+.-]*://)[^/\\s\"'?#]*@"), "$1(left out)@"},
@@ -73,7 +73,7 @@ bool isPartOfWord(char c) {
 
 }  // namespace
 
-// The longest first: a full host name holds the short one.
+// The longest first, because a full host name contains the short one.
 Redaction::Redaction(std::vector<std::string> names)
     : _names([&] {
         std::erase_if(names, [](const std::string& name) { return name.size() < 2; });
@@ -133,7 +133,7 @@ Value Redaction::value(const Value& given) const {
 }
 
 std::vector<std::string> namesOfMachine() {
-  // Of services, which say nothing about people.
+  // User names of services, which identify nobody.
   static const std::set<std::string> kKnown = {"root", "veltrad", "localhost", "nobody", "daemon"};
   constexpr uid_t kFirstPerson = 1000, kNobody = 65534;
   std::set<std::string> names;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Takes secrets, and what names people and machines, out of a text that is to be passed on. Any thread.
+// Removes secrets and names of people and machines from a text that is to be passed on. Any thread.
 #pragma once
 
 #include <string>
@@ -10,17 +10,17 @@
 
 namespace veltrad::ctl {
 
-// What was taken out is named in parentheses in its place.
+// Replaces each removed part by its kind in parentheses.
 class Redaction {
  public:
-  // `names`: of this machine and its people, taken out where they stand as whole words.
+  // `names`: of this machine and its users, removed where they are whole words.
   explicit Redaction(std::vector<std::string> names);
 
   // Private keys; user names, passwords, queries and fragments of URLs; e-mail addresses; home directories;
   // values that follow words like "token" or "password"; UUIDs, hardware addresses and long hexadecimal
   // numbers; the names.
   std::string text(std::string_view text) const;
-  // Also whatever stands under a key that has such a word in it.
+  // Also removes every value whose key contains such a word.
   Value value(const Value& value) const;
 
  private:

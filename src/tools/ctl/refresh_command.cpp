@@ -19,7 +19,7 @@ namespace {
 // The daemon gives a server 15 s, and may wait for another's fetch of the same name first.
 constexpr std::chrono::seconds kRefreshPatience{60};
 
-// Those with a record, else all.
+// The storebags with a record, or all if there is none.
 Result<std::vector<std::string>, std::string> namesToRefresh(ControlClient& daemon) {
   const auto status = daemon.ask(wire::question::kStatus);
   if (!status) return Failure{status.error()};

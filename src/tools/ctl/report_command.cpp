@@ -28,7 +28,7 @@ bool agreed(const std::string& file) {
   return answer == 'y' || answer == 'Y';
 }
 
-// 0, or errno. What could not be written whole is taken away.
+// 0, or an errno. A file that could not be written completely is removed.
 int writeNew(const std::string& path, std::string_view text) {
   FileDescriptor file(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   if (!file.isOpen()) return errno;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Section by section.
+// Makes the report section by section.
 #include "tools/ctl/report_text.h"
 
 #include <fmt/format.h>
@@ -81,7 +81,7 @@ std::string preferencesSection(const Options& options) {
   return formatPreferences(Dictionary{{"keys", std::move(kept)}});
 }
 
-// Of this file only what says nothing about who has the device.
+// Only the properties that do not identify the owner of the device.
 Dictionary deviceFacts(const Dictionary& all) {
   Dictionary kept;
   for (const auto& [key, value] : all) {
@@ -92,8 +92,8 @@ Dictionary deviceFacts(const Dictionary& all) {
   return kept;
 }
 
-// The content of what the daemon would parse; of certificates, keys and what cannot be parsed only that it is
-// there: nobody could say what stands in it.
+// The content of files that the daemon parses. Of certificates, keys and unparsable files only their
+// existence, because their content cannot be redacted.
 std::string contentOf(const std::string& path, const std::string& name, const Redaction& redaction) {
   const auto bytes = platform::DiskFileStore().read(path, kLargestReportedFile);
   if (!bytes) return cannot(bytes.error().description);

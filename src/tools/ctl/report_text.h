@@ -8,8 +8,8 @@
 
 namespace veltrad::ctl {
 
-// Asks the daemon, reads files and runs journalctl. A part that cannot be had is a line that says why. What
-// is secret or names people is not in it. No line break at the end.
+// Asks the daemon, reads files and runs journalctl. A part that is not available becomes a line that says
+// why. Secrets and names of people are removed. No line break at the end.
 std::string reportText(const Options& options);
 
 }  // namespace veltrad::ctl

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What `veltractl upload` prints on standard error.
+// Prints the progress and result of `veltractl upload` on standard error.
 #pragma once
 
 #include <string>

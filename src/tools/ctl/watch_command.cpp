@@ -20,7 +20,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kLookAgain{100};
 
-// Prints what fits, from begin() on.
+// Prints the messages that match the filter, from begin() on.
 class Watcher final : public support::FateReader::Listener {
  public:
   // `contents` is null if they are not asked for.
@@ -28,12 +28,12 @@ class Watcher final : public support::FateReader::Listener {
 
   void begin() { _printing = true; }
   bool failed() const { return _failed; }
-  // Of messages that were told.
+  // The number of printed messages whose contents were lost.
   std::uint64_t lostContents() const { return _lostContents; }
 
   void taken(const support::ToldMessage& message) override {
     if (!message.session || !fits(_options.care.fates, message)) return;
-    // Those with steps still to come. What is forgotten here is of messages long done.
+    // The messages with further steps. Beyond the bound the oldest are forgotten, which are long done.
     if (_told.size() == kMostTold) _told.erase(_told.begin());
     _told.insert(message.entry.message);
     if (!_printing) return;
@@ -112,13 +112,13 @@ int runWatch(ControlClient& daemon, const Options& options, Interrupt& interrupt
   FateSource source(daemon, watcher);
   const auto readOn = [&](bool patient) {
     auto done = source.readOn(patient);
-    // Also those that nobody asks for, so that others are not lost behind them.
+    // Also reads contents that were not asked for, so that newer ones are not lost.
     return done && options.care.contents ? contents.readOn() : std::move(done);
   };
   interrupt.begin();
-  // From now on the daemon keeps contents, so that it has those of all messages that are told.
+  // The daemon keeps contents from now on, before the first message is printed.
   Result<Done, std::string> done = options.care.contents ? contents.readOn() : Done();
-  // What was written before says what later entries mean.
+  // Reads the earlier entries first, because later ones refer to them.
   if (done) done = readOn(true);
   std::uint64_t missing = source.missing(), lost = 0;
   watcher.begin();

@@ -18,7 +18,7 @@ namespace veltrad::ctl {
 
 namespace {
 
-// Of messages; files and log data have numbers of their own.
+// The missing numbers of messages; files and log data have separate numbers.
 struct Gone {
   std::uint64_t messages = 0;
   std::int64_t before = 0;  // they were taken in earlier
@@ -29,7 +29,7 @@ struct Story {
   std::vector<const support::MessageFates*> told;
 };
 
-// What the record holds whole, and how many messages it no longer does.
+// The messages that the record holds completely, and the number of those that it no longer holds.
 Story storyOf(const support::FateBook& book, const FateSource& source, const Options& options) {
   const FateFilter& filter = options.care.fates;
   Story story;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers the three questions.
+// Answers the three requests.
 #include "gateway/admin.h"
 
 #include "gateway/metrics.h"

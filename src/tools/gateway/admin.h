@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// What those who look after a process ask it: /live, /ready, /metrics. On a thread of its own, so that it
-// answers whatever the rest is doing.
+// The administration endpoints of a process: /live, /ready, /metrics. They have their own thread, so that
+// they answer whatever the rest is doing.
 #pragma once
 
 #include <functional>

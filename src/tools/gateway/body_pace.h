@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How long a body may keep its connection waiting.
+// Limits the time that a slow body may take.
 #pragma once
 
 #include <chrono>
@@ -7,8 +7,8 @@
 
 namespace veltrad::gateway {
 
-// What is left of a body's time: it gets less while the connection waits for bytes, and more, up to what it
-// was at the start, with those that come. A body that comes fast enough never runs out of it.
+// The time left for a body. It decreases while the connection waits for bytes, and increases with received
+// bytes, up to the initial value. A body that is fast enough never exhausts it.
 class BodyPace {
  public:
   using Duration = std::chrono::steady_clock::duration;

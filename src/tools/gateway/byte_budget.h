@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Bounds what bodies keep in memory together.
+// Limits the memory of all bodies together.
 #pragma once
 
 #include <atomic>
@@ -21,7 +21,8 @@ class ByteBudget {
   std::atomic<std::uint64_t> _taken{0};
 };
 
-// What one body keeps of a budget, which must outlive it. It goes back at the end. One thread at a time.
+// The part of a budget that one body uses; the destructor returns it. The budget must outlive it. One thread
+// at a time.
 class Charge {
  public:
   explicit Charge(ByteBudget& budget) : _budget(&budget) {}

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Mends escapes in place, because U+FFFD takes as many characters as what it replaces.
+// Replaces escapes in place, because U+FFFD takes as many characters as the replaced escape.
 #include "gateway/clean_json.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads JSON that a device has sent, of which the database must be able to take everything.
+// Parses JSON of devices and restricts it to values that the database can store.
 #pragma once
 
 #include <cstddef>

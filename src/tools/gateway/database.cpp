@@ -18,7 +18,7 @@ namespace {
 
 constexpr std::size_t kCopyBytes = 1u << 20;
 
-// What a server has to say that it has given up a statement.
+// The time that a server has to report that it cancelled a statement.
 constexpr std::chrono::milliseconds kMostGrace{10'000};
 
 std::string oneLine(const char* text) {
@@ -49,7 +49,7 @@ void Database::Clear::operator()(pg_result* result) const {
 
 Result<std::unique_ptr<Database>, StoreError> Database::open(const std::string& dsn,
                                                              std::chrono::milliseconds longest) {
-  // What the DSN says counts more than what stands before it.
+  // Settings in the DSN override those before it.
   const std::pair<const char*, const char*> settings[] = {
       {"connect_timeout", "10"},   {"application_name", "veltra-gateway drain"},
       {"keepalives_idle", "10"},   {"keepalives_interval", "5"},

@@ -51,7 +51,7 @@ class Database {
 
   explicit Database(Connection connection) : _connection(std::move(connection)) {}
   Result<Done, StoreError> setLongest(std::chrono::milliseconds longest);
-  // Those that follow end by the deadline, which it sets.
+  // Sets the deadline for the following calls.
   void begin();
   Result<Done, StoreError> await(short events);
   Result<Done, StoreError> flush();

@@ -4,14 +4,14 @@
 
 #include <openssl/evp.h>
 
-#include <cstdlib>
+#include <new>
 
 #include "base/text.h"
 
 namespace veltrad::gateway {
 
 Digest::Digest() : _context(EVP_MD_CTX_new(), EVP_MD_CTX_free) {
-  if (EVP_DigestInit_ex(_context.get(), EVP_sha256(), nullptr) != 1) std::abort();
+  if (!_context || EVP_DigestInit_ex(_context.get(), EVP_sha256(), nullptr) != 1) throw std::bad_alloc();
 }
 
 void Digest::add(std::string_view bytes) {

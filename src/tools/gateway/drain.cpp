@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Begins anew after every error: with the connections, and with the position that the database has.
+// Restarts after every error: with new connections, and from the position in the database.
 #include "gateway/drain.h"
 
 #include <unistd.h>
@@ -8,6 +8,7 @@
 #include <ctime>
 
 #include "gateway/admin.h"
+#include "gateway/attempt.h"
 #include "gateway/metrics.h"
 #include "gateway/serve.h"
 #include "platform/limited_line.h"
@@ -33,7 +34,7 @@ std::int64_t nowNanoseconds() {
 }  // namespace
 
 void PurgePlan::reached(std::uint64_t seq, Time now) {
-  // One place a second is precise enough.
+  // One place for each second is precise enough.
   if (!_reached.empty() && now - _reached.back().first < kBetweenPurges && _reached.size() > 1)
     _reached.back().second = seq;
   else
@@ -109,20 +110,23 @@ void Drain::run() {
   platform::LimitedLine failures("failures");
   std::unique_ptr<StreamReader> looking;
   while (!stopping()) {
-    const std::string why = runOnce();
+    std::string why = "no memory";
+    attempt([&] { why = runOnce(); });
     _counts.active = false;
     if (why.empty()) continue;
     ++_counts.restarts;
-    if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
-    if (!looking || looking->isOver()) {
-      if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
-    }
-    if (looking) measure(*looking);
+    attempt([&] {
+      if (const auto line = failures.happened("drain: " + why)) logWarning("%s", line->c_str());
+      if (!looking || looking->isOver()) {
+        if (auto opened = StreamReader::open(_stream)) looking = std::move(opened).value();
+      }
+      if (looking) measure(*looking);
+    });
     pause(kBetweenTries);
   }
 }
 
-// How much waits is to be known above all while nothing can be written.
+// The number of waiting messages matters most while nothing can be written.
 void Drain::measure(StreamReader& reader) {
   const auto state = reader.state();
   if (!state) return;
@@ -227,7 +231,7 @@ Result<std::uint64_t, std::string> Drain::findPlace(StreamReader& reader, TableW
   return common;
 }
 
-// Times grow with places, so what is newer than the tables' last message took the place of what was lost.
+// Times grow with places, so messages newer than the tables' last one have replaced lost ones.
 Result<std::uint64_t, std::string> Drain::placeUpTo(StreamReader& reader, const StreamState& state,
                                                     std::uint64_t seq, std::int64_t time) {
   std::uint64_t low = std::min(std::max<std::uint64_t>(state.firstSeq, 1) - 1, seq);
@@ -244,7 +248,7 @@ Result<std::uint64_t, std::string> Drain::placeUpTo(StreamReader& reader, const 
   return low;
 }
 
-// Nothing came. A consumer that went with its server says nothing either, so the stream is asked.
+// Nothing came. A consumer that was lost with its server is silent, too, so the stream is checked.
 std::string Drain::lookAgain(StreamReader& reader, std::int64_t created) {
   const auto state = reader.state();
   if (!state) return state.error();
@@ -272,7 +276,7 @@ void Drain::keepHouse(StreamReader& reader, TableWriter& writer, std::int64_t re
 
 int drain(const Arguments& given) {
   blockStopSignals();
-  StreamOptions stream = streamOptions(given.stream);
+  StreamOptions stream = given.stream;
   stream.inbox = "_INBOX.veltra-drain";
   Drain carrying(std::move(stream), given.drain);
   const DrainCounts& counts = carrying.counts();

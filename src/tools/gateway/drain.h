@@ -20,7 +20,7 @@
 
 namespace veltrad::gateway {
 
-// What the stream may forget: places that were reached long enough ago. Decides from times alone.
+// Decides what may be purged from the stream: places that were reached long enough ago.
 class PurgePlan {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -37,14 +37,14 @@ class PurgePlan {
   std::deque<std::pair<Time, std::uint64_t>> _reached;
 };
 
-// Whether a stream has lost its newest messages, as one does whose servers have all lost power at once. Right
-// after a server has become the leader it may say less than it has, so only what stays so counts.
+// Detects whether a stream has lost its newest messages, as after a power cut of all its servers. A new
+// leader may at first report fewer messages than it has, so the loss must persist.
 class LostTail {
  public:
   using Time = std::chrono::steady_clock::time_point;
   static constexpr std::chrono::seconds kLongestCatchUp{20};
 
-  // `last` is the stream's word at this time, `reached` what the tables hold.
+  // `last` is the last place in the stream, `reached` that in the tables.
   bool isCertain(std::uint64_t reached, std::uint64_t last, Time now);
 
  private:
@@ -65,12 +65,13 @@ struct DrainCounts {
   std::string text() const;
 };
 
+// Its 13 fields are its settings, its counts, where it stands in the stream, and its thread.
 class Drain {
  public:
   Drain(StreamOptions stream, DrainArguments given);
   ~Drain() { stop(); }
 
-  // The error says what the operator must mend: the folder of files.
+  // The error says what the operator must repair: the folder of files.
   Result<Done, std::string> start();
   // After the batch that is being written.
   void stop();
@@ -97,11 +98,11 @@ class Drain {
   PieceStore _files;
   DrainCounts _counts;
   platform::LimitedLine _begins{"beginnings"};
-  // Of the stream that is being read.
+  // The purge plan of the stream that is being read.
   PurgePlan _purges;
   std::chrono::steady_clock::time_point _nextForgetting{};
   std::uint64_t _reached = 0;
-  // Where nothing came although the stream goes on; 0: nowhere.
+  // The place after which nothing came although the stream has more; 0 if none.
   std::uint64_t _silentAt = 0;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;

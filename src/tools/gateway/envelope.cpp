@@ -16,7 +16,7 @@ namespace {
 // 2101-01-01 00:00:00 UTC.
 constexpr double kEndOf2100 = 4'133'980'800;
 
-// Says what is wrong with the field; empty: nothing.
+// Describes the fault of the field; empty if there is none.
 std::string faultOfField(const std::string& key, const Value& value) {
   if (key.size() > kMostKeyBytes)
     return fmt::format("a key of {} bytes, at most {} are taken", key.size(), kMostKeyBytes);
@@ -84,8 +84,6 @@ Result<Envelope, std::string> parseEnvelope(std::string text) {
                                kMostIdentifierBytes)};
   const Array* events = fields->array("events");
   if (!events) return Failure{std::string("\"events\" is no array")};
-  if (events->size() > kMostEvents)
-    return Failure{fmt::format("{} events, at most {} are taken", events->size(), kMostEvents)};
   const Value* postTime = fields->find("postTime");
   if (postTime && !postTime->isNumber()) return Failure{std::string("\"postTime\" is no number")};
   Envelope envelope{*clientID, {}};

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// An envelope of events as devices post it, and what of an event has a column of its own in the tables.
+// Parses envelopes of events, and extracts the fields of an event that have columns in the tables.
 #pragma once
 
 #include <cstdint>
@@ -12,11 +12,9 @@
 
 namespace veltrad::gateway {
 
-// What no column takes is refused at the door. In bytes.
+// What no column takes is refused at the router. In bytes.
 inline constexpr std::size_t kMostIdentifierBytes = 1'024;
 inline constexpr std::size_t kMostKeyBytes = 256;
-// A device posts at most 4,096 at once. A small gzip stream of empty events must not become millions of rows.
-inline constexpr std::size_t kMostEvents = 65'536;
 
 struct Envelope {
   std::string clientID;

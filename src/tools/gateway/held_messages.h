@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The messages that the stream has not taken yet: which are to be published now, and which have waited too
-// long.
+// The messages that the stream has not confirmed yet: decides which are published now, and which have waited
+// too long.
 #pragma once
 
 #include <chrono>
@@ -24,9 +24,13 @@ enum class Outcome {
   late,
   // There is no room to hold the message.
   full,
+  // There was no memory to hold it.
+  shortage,
 };
+// The name under which what was not taken is counted.
+const char* reasonOf(Outcome outcome);
 
-// Decides; the publisher acts. Used by one thread at a time.
+// Decides; the publisher acts. Used by one thread at a time. Only add() wants memory.
 class HeldMessages {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -45,6 +49,12 @@ class HeldMessages {
     Duration afterRefusal = std::chrono::milliseconds(250);
   };
 
+  // Who waits for a message, and since when.
+  struct Waiter {
+    Time since;
+    Completion completion;
+  };
+
   struct Due {
     std::uint64_t token;
     std::shared_ptr<const Message> message;
@@ -52,19 +62,19 @@ class HeldMessages {
 
   explicit HeldMessages(Bounds bounds) : _bounds(bounds) {}
 
-  // Holds the message, which is due at once. One with the ID of a message that is held joins it. False: there
-  // is no room, and the completion is not kept.
-  bool add(Message message, Completion completion, Time now);
-  // What is to be published now. It is due again later.
-  std::vector<Due> due(Time now);
-  // The completions of a message that the stream has taken; none if it is not held any more.
-  std::vector<Completion> taken(std::uint64_t token);
+  // Holds the message, which is due at once, and takes the completion. One with the ID of a message that is
+  // held joins it. False, or std::bad_alloc: the completion is not taken, and nothing has changed.
+  bool add(Message message, Completion& completion, Time now);
+  // A message that is to be published now. It is due again later.
+  std::optional<Due> due(Time now);
+  // Those who waited for a message that the stream has taken; none if it is not held any more.
+  std::vector<Waiter> taken(std::uint64_t token);
   // The stream has answered that it does not take the message now.
   void refused(std::uint64_t token, Time now);
   // Everything is due, because the stream can be reached again.
   void allDue(Time now);
-  // The completions of messages that were held too long.
-  std::vector<Completion> expired(Time now);
+  // Those who waited for a message that was held too long; none: there is no such message.
+  std::vector<Waiter> expired(Time now);
   // No message is held beyond this time.
   void endBy(Time end);
   // When due() or expired() next has something; absent if nothing is held.
@@ -76,17 +86,17 @@ class HeldMessages {
  private:
   struct Held {
     std::shared_ptr<const Message> message;
-    std::vector<Completion> completions;
-    Time since;
+    // The first is the one with whom it came.
+    std::vector<Waiter> waiters;
     Time due;
     Duration wait;
     Duration refusalWait;
   };
   using Entries = std::map<std::uint64_t, Held>;
 
-  std::vector<Completion> remove(Entries::iterator entry);
+  std::vector<Waiter> remove(Entries::iterator entry);
   void setDue(Entries::iterator entry, Time due);
-  Time endOf(const Held& held) const { return std::min(held.since + _bounds.hold, _end); }
+  Time endOf(const Held& held) const { return std::min(held.waiters.front().since + _bounds.hold, _end); }
 
   const Bounds _bounds;
   Time _end = Time::max();

@@ -2,7 +2,11 @@
 // Reads requests one after the other and answers them.
 #include "gateway/http_connection.h"
 
+#include <sys/socket.h>
+
 #include <limits>
+
+#include "gateway/attempt.h"
 
 namespace veltrad::gateway {
 
@@ -37,33 +41,58 @@ class Head final : public RequestHead {
 
 }  // namespace
 
+std::shared_ptr<HTTPConnection> HTTPConnection::make(Owner& owner, Socket socket) {
+  // The last to hold it may be another thread.
+  return {new HTTPConnection(owner, std::move(socket)), [](HTTPConnection* last) {
+            last->_owner.context.get_executor().dispatch([owned = std::unique_ptr<HTTPConnection>(last)] {},
+                                                         HandlerAllocator<void>(last->_memory));
+          }};
+}
+
+std::function<void()> HTTPConnection::later(Step step) {
+  return [self = shared_from_this(), step] {
+    self->_owner.context.get_executor().post([self, step] { self->run(step, {}, 0); },
+                                             HandlerAllocator<void>(self->_memory));
+  };
+}
+
+void HTTPConnection::run(Step step, const Error& error, std::size_t count) {
+  if (!attempt([&] { (this->*step)(error, count); })) refuseForShortage();
+}
+
+// Wants no memory. Nothing is begun, so the connection ends.
+void HTTPConnection::refuseForShortage() {
+  _owner.ranShort();
+  if (_state == State::owesAnswer)
+    ::send(_stream.socket().native_handle(), _owner.shortage.data(), _owner.shortage.size(),
+           MSG_DONTWAIT | MSG_NOSIGNAL);
+}
+
 void HTTPConnection::closeIfIdle() {
-  if (_idle) _stream.cancel();
+  if (_state == State::idle) _stream.cancel();
 }
 
 void HTTPConnection::readHead() {
   if (_owner.stopping) return;
-  _idle = true;
+  _state = State::idle;
   _parser.emplace();
   _parser->header_limit(static_cast<std::uint32_t>(_owner.bounds.headerBytes));
-  // Who takes the body counts its bytes.
+  // The handler counts the body's bytes.
   _parser->body_limit(std::numeric_limits<std::uint64_t>::max());
   _stream.expires_after(_owner.bounds.idle);
-  http::async_read_header(
-      _stream, _buffer, *_parser,
-      [self = shared_from_this()](const Error& error, std::size_t) { self->headRead(error); });
+  http::async_read_header(_stream, _buffer, *_parser, then(&HTTPConnection::headRead));
 }
 
-void HTTPConnection::headRead(const Error& error) {
-  _idle = false;
+void HTTPConnection::headRead(const Error& error, std::size_t) {
+  _state = State::owesAnswer;
   if (error) return headRefused(error);
   const auto length = _parser->content_length();
   auto handled =
       _owner.handler(Head(_parser->get(), length ? std::optional<std::uint64_t>(*length) : std::nullopt));
   if (auto* refusal = std::get_if<Answer>(&handled)) return answer(std::move(*refusal), !_parser->is_done());
-  _taker = std::move(std::get<std::unique_ptr<BodyTaker>>(handled));
+  _bodyHandler = std::move(std::get<std::unique_ptr<BodyHandler>>(handled));
   if (_parser->is_done()) return finish();
-  _parser->get().body().taker = _taker.get();
+  _parser->get().body().handler = _bodyHandler.get();
   _pace = BodyPace(_owner.bounds.stalled);
   _buffer.reserve(kReadBytes);
   continueThenRead();
@@ -84,27 +113,23 @@ void HTTPConnection::continueThenRead() {
   if (!beast::iequals(_parser->get()[http::field::expect], "100-continue")) return readBody();
   static constexpr std::string_view kContinue = "HTTP/1.1 100 Continue\r\n\r\n";
   boost::asio::async_write(_stream, boost::asio::buffer(kContinue.data(), kContinue.size()),
-                           [self = shared_from_this()](const Error& error, std::size_t) {
-                             if (!error) self->readBody();
-                           });
+                           then(&HTTPConnection::goOn));
+}
+
+void HTTPConnection::goOn(const Error& error, std::size_t) {
+  if (!error) readBody();
 }
 
 void HTTPConnection::readBody() {
   if (_parser->is_done()) return finish();
-  const auto resume = [self = shared_from_this()] {
-    boost::asio::post(self->_stream.get_executor(), [self] { self->readBody(); });
-  };
-  if (!_taker->hasRoom(resume)) return _stream.expires_never();
-  const auto begun = std::chrono::steady_clock::now();
+  if (!_bodyHandler->hasRoom(later(&HTTPConnection::goOn))) return _stream.expires_never();
+  _waitsSince = std::chrono::steady_clock::now();
   _stream.expires_after(_pace.left());
-  http::async_read_some(_stream, _buffer, *_parser,
-                        [self = shared_from_this(), begun](const Error& error, std::size_t count) {
-                          self->_pace.passed(std::chrono::steady_clock::now() - begun, count);
-                          self->bodyRead(error);
-                        });
+  http::async_read_some(_stream, _buffer, *_parser, then(&HTTPConnection::bodyRead));
 }
 
-void HTTPConnection::bodyRead(const Error& error) {
+void HTTPConnection::bodyRead(const Error& error, std::size_t count) {
+  _pace.passed(std::chrono::steady_clock::now() - _waitsSince, count);
   if (auto& refusal = _parser->get().body().refusal) return answer(std::move(*refusal), !_parser->is_done());
   if (!error || error == http::error::need_buffer) return readBody();
   if (error.category() == http::make_error_code(http::error::bad_method).category() &&
@@ -115,10 +140,11 @@ void HTTPConnection::bodyRead(const Error& error) {
 void HTTPConnection::finish() {
   _buffer.shrink_to_fit();
   _stream.expires_never();
-  _taker->finish([self = shared_from_this()](Answer made) {
-    boost::asio::post(self->_stream.get_executor(),
-                      [self, made = std::move(made)]() mutable { self->answer(std::move(made), false); });
-  });
+  _bodyHandler->finish(later(&HTTPConnection::finished));
+}
+
+void HTTPConnection::finished(const Error&, std::size_t) {
+  answer(_bodyHandler->answer(), false);
 }
 
 void HTTPConnection::answer(Answer made, bool closes) {
@@ -132,16 +158,14 @@ void HTTPConnection::answer(Answer made, bool closes) {
   _response->body() = std::move(made.body);
   _response->prepare_payload();
   _stream.expires_after(_owner.bounds.stalled);
-  http::async_write(_stream, *_response,
-                    [self = shared_from_this(), closes](const Error& error, std::size_t) {
-                      self->answered(error, closes);
-                    });
+  http::async_write(_stream, *_response, then(&HTTPConnection::answered));
+  _state = State::answers;
 }
 
-void HTTPConnection::answered(const Error& error, bool closes) {
-  const bool whole = _parser->is_done();
+void HTTPConnection::answered(const Error& error, std::size_t) {
+  const bool whole = _parser->is_done(), closes = !_response->keep_alive();
   _response.reset();
-  _taker.reset();
+  _bodyHandler.reset();
   if (error) return;
   if (!closes) {
     _buffer.shrink_to_fit();
@@ -157,11 +181,12 @@ void HTTPConnection::answered(const Error& error, bool closes) {
 }
 
 void HTTPConnection::linger() {
-  _stream.async_read_some(_buffer.prepare(kReadBytes),
-                          [self = shared_from_this()](const Error& error, std::size_t count) {
-                            self->_lingered += count;
-                            if (!error && self->_lingered < kMostLingering) self->linger();
-                          });
+  _stream.async_read_some(_buffer.prepare(kReadBytes), then(&HTTPConnection::lingered));
+}
+
+void HTTPConnection::lingered(const Error& error, std::size_t count) {
+  _lingered += count;
+  if (!error && _lingered < kMostLingering) linger();
 }
 
 }  // namespace veltrad::gateway

@@ -2,6 +2,7 @@
 // Accepts connections, with Boost.Beast, which only this file and http_connection.cpp include.
 #include "gateway/http_server.h"
 
+#include <fmt/format.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -12,6 +13,7 @@
 #include <set>
 
 #include "base/file_descriptor.h"
+#include "gateway/attempt.h"
 #include "gateway/http_connection.h"
 #include "platform/daemon_lock.h"
 #include "platform/limited_line.h"
@@ -44,12 +46,14 @@ std::optional<HostAndPort> hostAndPortOf(const std::string& address) {
 }  // namespace
 
 struct HTTPServer::Library : HTTPConnection::Owner {
-  Library(Handler given, Bounds given_bounds)
-      : HTTPConnection::Owner{std::move(given), given_bounds}, acceptor(context), pause(context) {}
+  Library() : HTTPConnection::Owner(ownContext), acceptor(ownContext), pause(ownContext) {}
 
+  void run();
   void accept();
   void accepted(const boost::system::error_code& error, Socket socket);
   void closed(HTTPConnection& connection) override;
+  void ranShort() override;
+  void say(const std::string& failure);
   void stopNow();
 
   // One thread runs the context, so nothing here is locked. The context is destroyed before what its
@@ -60,23 +64,56 @@ struct HTTPServer::Library : HTTPConnection::Owner {
   std::set<HTTPConnection*> connections;
   std::atomic<std::size_t> count{0};
   std::function<void()> stopped;
+  std::function<void()> onShortage;
   platform::LimitedLine shortages{"failures"};
-  boost::asio::io_context context{1};
+  HandlerMemory acceptMemory;
+  // Held by the handler of an accept.
+  std::weak_ptr<void> accepting;
+  boost::asio::io_context ownContext{1};
   boost::asio::basic_socket_acceptor<boost::asio::generic::stream_protocol> acceptor;
   boost::asio::steady_timer pause;
 };
 
+// What finds no memory ends where it is: an operation of a connection, and with it the connection, or an
+// accept, which is begun again here.
+void HTTPServer::Library::run() {
+  const auto work = boost::asio::make_work_guard(context);
+  bool rests = false;
+  while (!context.stopped()) {
+    const bool found = attempt([&] {
+      if (rests) context.run_for(kShortagePause);
+      accept();
+      context.run();
+    });
+    rests = !found;
+    if (rests) ranShort();
+  }
+}
+
+void HTTPServer::Library::ranShort() {
+  onShortage();
+  attempt([this] { say("http: a connection was not served: there is no memory"); });
+}
+
+void HTTPServer::Library::say(const std::string& failure) {
+  if (const auto line = shortages.happened(failure)) logWarning("%s", line->c_str());
+}
+
 void HTTPServer::Library::accept() {
-  if (stopping || connections.size() >= bounds.connections) return;
+  if (stopping || !accepting.expired() || connections.size() >= bounds.connections) return;
+  auto pending = std::make_shared<char>();
+  accepting = pending;
   acceptor.async_accept(
-      [this](const boost::system::error_code& error, Socket socket) { accepted(error, std::move(socket)); });
+      [this, pending = std::move(pending)](const boost::system::error_code& error, Socket socket) mutable {
+        pending.reset();
+        accepted(error, std::move(socket));
+      });
 }
 
 void HTTPServer::Library::accepted(const boost::system::error_code& error, Socket socket) {
   if (stopping) return;
   if (error) {
-    if (const auto line = shortages.happened("http: a connection was not accepted: " + error.message()))
-      logWarning("%s", line->c_str());
+    say("http: a connection was not accepted: " + error.message());
     pause.expires_after(kShortagePause);
     pause.async_wait([this](const boost::system::error_code& cancelled) {
       if (!cancelled) accept();
@@ -85,11 +122,7 @@ void HTTPServer::Library::accepted(const boost::system::error_code& error, Socke
   }
   boost::system::error_code ignored;
   socket.set_option(boost::asio::ip::tcp::no_delay(true), ignored);
-  // The last to hold it may be another thread.
-  const std::shared_ptr<HTTPConnection> connection(
-      new HTTPConnection(*this, std::move(socket)), [this](HTTPConnection* last) {
-        boost::asio::dispatch(context, [owned = std::unique_ptr<HTTPConnection>(last)] {});
-      });
+  const auto connection = HTTPConnection::make(*this, std::move(socket));
   connections.insert(connection.get());
   count = connections.size();
   connection->start();
@@ -101,7 +134,8 @@ void HTTPServer::Library::closed(HTTPConnection& connection) {
   connections.erase(&connection);
   count = connections.size();
   if (stopping && connections.empty() && stopped) return std::exchange(stopped, nullptr)();
-  if (wasFull) accept();
+  if (wasFull && !stopping)
+    context.get_executor().post([this] { accept(); }, HandlerAllocator<void>(acceptMemory));
 }
 
 void HTTPServer::Library::stopNow() {
@@ -116,11 +150,21 @@ void HTTPServer::Library::stopNow() {
   for (HTTPConnection* connection : open) connection->closeIfIdle();
 }
 
-HTTPServer::HTTPServer(Handler handler, Bounds bounds)
-    : _library(std::make_unique<Library>(std::move(handler), bounds)) {}
+HTTPServer::HTTPServer(Handler handler, Bounds bounds, std::function<void()> onShortage)
+    : _library(std::make_unique<Library>()) {
+  const auto reason = boost::beast::http::obsolete_reason(
+      boost::beast::http::int_to_status(static_cast<unsigned>(bounds.shortage)));
+  _library->shortage = fmt::format(
+      "HTTP/1.1 {} {}\r\nX-VLT-Refused: no_memory\r\nRetry-After: 10\r\nContent-Length: 0\r\nConnection: "
+      "close\r\n\r\n",
+      bounds.shortage, std::string_view(reason.data(), reason.size()));
+  _library->handler = std::move(handler);
+  _library->bounds = bounds;
+  _library->onShortage = std::move(onShortage);
+}
 
 HTTPServer::~HTTPServer() {
-  // Connections end without a word, with the context's handlers.
+  // Connections are closed without an answer, with the context's handlers.
   _library->stopping = true;
   _library->stopped = nullptr;
 }
@@ -181,8 +225,7 @@ void HTTPServer::stop(std::function<void()> done) {
 }
 
 void HTTPServer::run() {
-  const auto work = boost::asio::make_work_guard(_library->context);
-  _library->context.run();
+  _library->run();
 }
 
 void HTTPServer::end() {

@@ -18,7 +18,7 @@
 
 namespace veltrad::gateway {
 
-// What the handler gets to see of a request's head. Valid during the call.
+// The head of a request, for the handler. Valid during the call.
 class RequestHead {
  public:
   virtual ~RequestHead() = default;
@@ -38,25 +38,29 @@ struct Answer {
   std::vector<std::pair<std::string, std::string>> headers;
 };
 
-// Takes the body of one request. Used on the server's thread, which destroys it, and not before the answer
-// that it owes.
-class BodyTaker {
+// Takes the body of one request. Used on the server's thread, which destroys it, and not before the end of
+// what it was asked for. Where it throws std::bad_alloc, it keeps no function that it was given, and the
+// request is refused.
+class BodyHandler {
  public:
-  virtual ~BodyTaker() = default;
+  virtual ~BodyHandler() = default;
   // Takes the next bytes from the front, not all of them if that were a long turn: the rest comes again after
   // others had theirs. An answer refuses everything: the connection is closed after it, unless it was the
   // end.
   virtual std::optional<Answer> take(std::string_view& bytes) = 0;
-  // False: there is no room for more bytes now. `resume` is then called once, on any thread, when there is.
+  // False: there is no room for more bytes now. `resume`, which wants no memory and throws nothing, is then
+  // called once, on any thread, when there is.
   virtual bool hasRoom(std::function<void()> resume) = 0;
-  // After the last byte. `answer` is called once, on any thread, now or later.
-  virtual void finish(std::function<void(Answer)> answer) = 0;
+  // After the last byte. `done`, which is like `resume`, is called once, on any thread, now or later, and
+  // then answer().
+  virtual void finish(std::function<void()> done) = 0;
+  virtual Answer answer() = 0;
 };
 
 class HTTPServer {
  public:
-  // Answers a request at its head, or returns who takes its body. On the server's thread.
-  using Handler = std::function<std::variant<Answer, std::unique_ptr<BodyTaker>>(const RequestHead&)>;
+  // Answers a request by its head, or returns the handler of its body. On the server's thread.
+  using Handler = std::function<std::variant<Answer, std::unique_ptr<BodyHandler>>(const RequestHead&)>;
 
   struct Bounds {
     std::size_t connections = 16'000;
@@ -66,9 +70,14 @@ class HTTPServer {
     // How long a body may be without a byte, or slower than BodyPace allows, and an answer without a byte
     // that is taken.
     std::chrono::seconds stalled{30};
+    // The status for a request that there is no memory for.
+    int shortage = 503;
   };
 
-  HTTPServer(Handler handler, Bounds bounds);
+  // `onShortage`, which must not throw, is called for each request or connection that ended for want of
+  // memory.
+  HTTPServer(
+      Handler handler, Bounds bounds, std::function<void()> onShortage = [] {});
   ~HTTPServer();
 
   // Listens on "HOST:PORT" or "unix:PATH", and returns the same with the port that was given for port 0. The

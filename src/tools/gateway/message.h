@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What gateways put into the stream and the drain takes out: subjects, headers, messages.
+// The format of messages in the stream: subjects, headers, messages.
 #pragma once
 
 #include <string>
@@ -35,7 +35,7 @@ inline constexpr const char* kVia = "Veltra-Via";
 inline constexpr const char* kReason = "Veltra-Reason";
 // Where log data is said to be.
 inline constexpr const char* kLocation = "Veltra-Location";
-// What is known of a file, as a JSON object.
+// The metadata of a file, as a JSON object.
 inline constexpr const char* kFile = "Veltra-File";
 // "TOKEN OFFSET": the body is to be written there. In any message but a piece: the body is the last piece.
 inline constexpr const char* kPiece = "Veltra-Piece";
@@ -49,7 +49,7 @@ struct Message {
   std::vector<std::pair<std::string, std::string>> headers;
   std::string body;
 
-  // What it keeps in memory, about.
+  // The approximate memory that it uses.
   std::size_t bytes() const {
     std::size_t bytes = body.size() + id.size() + 256;
     for (const auto& [name, text] : headers) bytes += name.size() + text.size();

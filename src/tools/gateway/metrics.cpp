@@ -52,7 +52,7 @@ void Metrics::published(std::chrono::steady_clock::duration took) {
   _microseconds.fetch_add(static_cast<std::uint64_t>(seconds * 1e6), std::memory_order_relaxed);
 }
 
-std::string Metrics::text(std::size_t held) const {
+std::string Metrics::text(std::size_t connections, std::size_t held) const {
   std::string text = metricHead("veltra_gateway_build", "info", "The running program.") +
                      fmt::format("veltra_gateway_build_info{{version=\"{}\"}} 1\n", kVersion);
   text += counterText("veltra_gateway_events", "Events of posts that were answered 200.", events);

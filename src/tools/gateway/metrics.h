@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// What gateway and drain count, and its text. Any thread.
+// The counters of gateway and drain, and their OpenMetrics text. Any thread.
 #pragma once
 
 #include <array>
 #include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <initializer_list>
 #include <map>
 #include <string>
 #include <string_view>
@@ -14,9 +15,14 @@
 
 namespace veltrad::gateway {
 
-// A counter whose values are told apart by one label, of which there are few values.
+// A counter whose values are told apart by one label, of which there are few values. Only the first time that
+// a value is counted wants memory.
 class LabelledCounter {
  public:
+  // Those that are known are counted without memory from the first time on.
+  LabelledCounter(std::initializer_list<const char*> known) {
+    for (const char* label : known) _values.emplace(label, 0);
+  }
   void add(std::string_view label, std::uint64_t count = 1);
   std::map<std::string, std::uint64_t> values() const;
 
@@ -25,7 +31,7 @@ class LabelledCounter {
   std::map<std::string, std::uint64_t, std::less<>> _values GUARDED_BY(_mutex);
 };
 
-// Of a gateway.
+// The metrics of a gateway.
 class Metrics {
  public:
   void published(std::chrono::steady_clock::duration took);
@@ -34,12 +40,11 @@ class Metrics {
   std::atomic<std::uint64_t> posts{0};
   std::atomic<std::uint64_t> files{0};
   std::atomic<std::uint64_t> logData{0};
-  std::atomic<std::int64_t> connections{0};
-  LabelledCounter datagrams;
-  LabelledCounter refused;
+  LabelledCounter datagrams{"acknowledged", "taken", "held_too_long", "no_room", "no_memory"};
+  LabelledCounter refused{"no_memory"};
 
-  // OpenMetrics. `held`: messages that the stream has not taken yet.
-  std::string text(std::size_t held) const;
+  // OpenMetrics. `connections`: those that are open; `held`: messages that the stream has not taken yet.
+  std::string text(std::size_t connections, std::size_t held) const;
 
  private:
   // In seconds; what took longer is in the last bucket.

@@ -9,6 +9,7 @@
 #include <cstring>
 #include <fstream>
 
+#include "gateway/attempt.h"
 #include "platform/log.h"
 
 namespace veltrad::gateway {
@@ -21,7 +22,7 @@ constexpr int kMostPingsOut = 2;
 constexpr std::int64_t kReconnectMilliseconds = 250;
 constexpr std::int64_t kConnectMilliseconds = 2'000;
 constexpr std::int64_t kWriteMilliseconds = 5'000;
-// A connection that is lost keeps nothing: what was not answered is published again.
+// A lost connection keeps nothing, because unanswered messages are published again.
 constexpr int kReconnectBytes = 64 << 10;
 constexpr std::chrono::seconds kLongestClose{5};
 
@@ -79,8 +80,10 @@ struct NATSCallbacks {
   // Without it the library writes to standard error.
   static void failed(natsConnection*, natsSubscription*, natsStatus status, void* closure) {
     auto* self = static_cast<NATSConnection*>(closure);
-    if (const auto line = self->_faults.happened(std::string("stream: ") + natsStatus_GetText(status)))
-      logWarning("%s", line->c_str());
+    attempt([&] {
+      if (const auto line = self->_faults.happened(std::string("stream: ") + natsStatus_GetText(status)))
+        logWarning("%s", line->c_str());
+    });
   }
 };
 

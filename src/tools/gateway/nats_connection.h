@@ -21,23 +21,24 @@ struct StreamOptions {
   // "nats://HOST:PORT"
   std::vector<std::string> servers{"nats://127.0.0.1:4222"};
   std::string name = "VELTRA";
-  // What stands before each subject, with a dot at its end.
+  // The prefix of each subject, with a dot at its end.
   std::string prefix = "veltra.";
   int copies = 3;
-  // What the stream may hold; beyond it the stream takes nothing. 0: no bound.
+  // The maximum size of the stream, beyond which it refuses messages; 0 means no bound.
   std::int64_t mostBytes = 0;
   // Files with a user's credentials (a line "NAME:PASSWORD", or what the servers' own tools write), and with
   // the certificates that the servers' are signed by; empty: none.
   std::string credentials;
   std::string ca;
-  // What stands before the subjects of answers, so that no user needs to see those to others.
+  // The prefix of the subjects of answers, so that no user needs access to the answers to others.
   std::string inbox = "_INBOX.veltra-gateway";
 };
 
 // Closes the connection when it is destroyed. Any thread.
 class NATSConnection {
  public:
-  // Does not wait for a server to be there. `reconnected` is called on a thread of the library.
+  // Does not wait for a server to be there. `reconnected`, which must not throw, is called on a thread of the
+  // library.
   static Result<std::unique_ptr<NATSConnection>, std::string> open(const StreamOptions& options,
                                                                    std::function<void()> reconnected);
   ~NATSConnection();

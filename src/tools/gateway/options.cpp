@@ -47,107 +47,68 @@ std::string faultOfPrefix(const std::string& prefix) {
   return good ? "" : "expected words with a dot behind each";
 }
 
-void describeStream(CLI::App& app, StreamArguments& given) {
-  app.add_option("--server", given.servers, "A server of the stream; repeat the option for each")
-      ->type_name("URL")
-      ->allow_extra_args(false)
-      ->capture_default_str();
-  app.add_option("--stream", given.name, "Name of the stream")
-      ->type_name("NAME")
-      ->check(&faultOfStreamName)
-      ->capture_default_str();
-  app.add_option("--prefix", given.prefix, "What stands before each subject, with a dot at its end")
-      ->type_name("TEXT")
-      ->check(&faultOfPrefix)
-      ->capture_default_str();
-  app.add_option("--credentials", given.credentials,
-                 "File with the credentials of the stream's user: a line NAME:PASSWORD, or what the servers' "
-                 "tools write")
-      ->type_name("FILE");
-  app.add_option("--ca", given.ca, "File with the certificates that sign those of the stream's servers")
-      ->type_name("FILE");
+// Its default, if there is one, is shown in the help.
+template <typename T>
+CLI::Option* option(CLI::App& app, const char* name, T& value, const char* type, const char* help) {
+  return app.add_option(name, value, help)->type_name(type)->capture_default_str();
 }
 
-void describeServing(CLI::App& app, ServeArguments& given) {
-  app.add_option("--listen", given.listen,
-                 "Where requests are taken: IP:PORT or unix:PATH; port 0: any free one")
-      ->type_name("ADDRESS")
-      ->capture_default_str();
-  app.add_option("--admin", given.admin, "Where /live, /ready and /metrics are answered")
-      ->type_name("ADDRESS")
-      ->capture_default_str();
-  app.add_option("--dashboard", given.dashboard, "Where datagrams are taken: IPv4:PORT; without it none are")
-      ->type_name("ADDRESS");
-  app.add_option("--copies", given.copies, "Copies that a stream keeps which is made here")
-      ->type_name("N")
-      ->check(CLI::Range(1, 5))
-      ->capture_default_str();
-  app.add_option("--stream-bytes", given.streamBytes, "What a stream that is made here may hold; 0: no bound")
-      ->type_name("BYTES")
-      ->check(CLI::NonNegativeNumber)
-      ->capture_default_str();
-  app.add_option("--hold", given.hold, "Seconds for which something is held that the stream has not taken")
-      ->type_name("SECONDS")
-      ->check(CLI::Range(0.1, 60.0))
-      ->capture_default_str();
-  app.add_option(
-         "--hold-bytes", given.holdBytes,
+void describeStream(CLI::App& app, StreamOptions& given) {
+  option(app, "--server", given.servers, "URL", "A server of the stream; repeat the option for each")
+      ->allow_extra_args(false);
+  option(app, "--stream", given.name, "NAME", "Name of the stream")->check(&faultOfStreamName);
+  option(app, "--prefix", given.prefix, "TEXT", "What stands before each subject, with a dot at its end")
+      ->check(&faultOfPrefix);
+  option(app, "--credentials", given.credentials, "FILE",
+         "File with the credentials of the stream's user: a line NAME:PASSWORD, or what the servers' "
+         "tools write");
+  option(app, "--ca", given.ca, "FILE", "File with the certificates that sign those of the stream's servers");
+}
+
+void describeServing(CLI::App& app, ServeArguments& given, StreamOptions& stream) {
+  option(app, "--listen", given.listen, "ADDRESS",
+         "Where requests are taken: IP:PORT or unix:PATH; port 0: any free one");
+  option(app, "--admin", given.admin, "ADDRESS", "Where /live, /ready and /metrics are answered");
+  option(app, "--dashboard", given.dashboard, "ADDRESS",
+         "Where datagrams are taken: IPv4:PORT; without it none are");
+  option(app, "--copies", stream.copies, "N", "Copies that a stream keeps which is made here")
+      ->check(CLI::Range(1, 5));
+  option(app, "--stream-bytes", stream.mostBytes, "BYTES",
+         "What a stream that is made here may hold; 0: no bound")
+      ->check(CLI::NonNegativeNumber);
+  option(app, "--hold", given.hold, "SECONDS",
+         "Seconds for which something is held that the stream has not taken")
+      ->check(CLI::Range(0.1, 60.0));
+  option(app, "--hold-bytes", given.holdBytes, "BYTES",
          "What is held together; as much for events from their head to the answer, half of it for the rest")
-      ->type_name("BYTES")
-      ->check(CLI::Range(kLeastHoldBytes, std::size_t{1} << 40))
-      ->capture_default_str();
-  app.add_option("--hold-messages", given.holdMessages, "How many messages are held")
-      ->type_name("N")
-      ->check(CLI::Range(kLeastHoldMessages, std::size_t{1} << 20))
-      ->capture_default_str();
-  app.add_option("--connections", given.connections, "How many connections are open at once")
-      ->type_name("N")
-      ->check(CLI::Range(std::size_t{1}, std::size_t{1} << 20))
-      ->capture_default_str();
-  app.add_option(
-         "--shed", given.shed,
+      ->check(CLI::Range(kLeastHoldBytes, std::size_t{1} << 40));
+  option(app, "--hold-messages", given.holdMessages, "N", "How many messages are held")
+      ->check(CLI::Range(kLeastHoldMessages, std::size_t{1} << 20));
+  option(app, "--connections", given.connections, "N", "How many connections are open at once")
+      ->check(CLI::Range(std::size_t{1}, std::size_t{1} << 20));
+  option(app, "--shed", given.shed, "STATUS",
          "Status for what cannot be taken. 503 makes a device's back end report nothing until its state is "
          "computed anew, which takes load away for long; 429 does not")
-      ->type_name("STATUS")
-      ->check(CLI::IsMember({429, 503}))
-      ->capture_default_str();
+      ->check(CLI::IsMember({429, 503}));
 }
 
-void describeDrain(CLI::App& app, Arguments& given) {
-  DrainArguments& drain = given.drain;
-  app.add_option("--admin", drain.admin, "Where /live, /ready and /metrics are answered")
-      ->type_name("ADDRESS")
-      ->capture_default_str();
-  app.add_option("--database", drain.database, "The database, as libpq takes it [PGHOST and others]")
-      ->type_name("DSN");
-  app.add_option("--files", drain.files, "Folder of the files that devices have uploaded")
-      ->type_name("DIR")
-      ->capture_default_str();
-  app.add_option("--batch", drain.batch, "Most messages in one transaction")
-      ->type_name("N")
-      ->check(CLI::Range(1, 10'000))
-      ->capture_default_str();
-  app.add_option("--statement-timeout", drain.statement,
-                 "Seconds that a statement of the database may take; housekeeping has half an hour")
-      ->type_name("SECONDS")
-      ->check(CLI::Range(0.1, 1'800.0))
-      ->capture_default_str();
-  app.add_option(
-         "--purge-after", drain.purgeAfter,
+void describeDrain(CLI::App& app, DrainArguments& given) {
+  option(app, "--admin", given.admin, "ADDRESS", "Where /live, /ready and /metrics are answered");
+  option(app, "--database", given.database, "DSN", "The database, as libpq takes it [PGHOST and others]");
+  option(app, "--files", given.files, "DIR", "Folder of the files that devices have uploaded");
+  option(app, "--batch", given.batch, "N", "Most messages in one transaction")->check(CLI::Range(1, 10'000));
+  option(app, "--statement-timeout", given.statement, "SECONDS",
+         "Seconds that a statement of the database may take; housekeeping has half an hour")
+      ->check(CLI::Range(0.1, 1'800.0));
+  option(app, "--purge-after", given.purgeAfter, "SECONDS",
          "Seconds after which the stream forgets what the tables hold. Servers that start anew learn the IDs "
          "of the last two minutes from what the stream holds")
-      ->type_name("SECONDS")
-      ->check(CLI::Range(0.0, 1e9))
-      ->capture_default_str();
-  app.add_option("--post-days", drain.postDays,
-                 "Days for which the IDs of posts are kept; at least one more than devices keep posts")
-      ->type_name("DAYS")
-      ->check(CLI::Range(0.0, 3650.0))
-      ->capture_default_str();
-  app.add_option("--keep-days", drain.keepDays, "Days for which everything else is kept; 0: for ever")
-      ->type_name("DAYS")
-      ->check(CLI::Range(0.0, 36500.0))
-      ->capture_default_str();
+      ->check(CLI::Range(0.0, 1e9));
+  option(app, "--post-days", given.postDays, "DAYS",
+         "Days for which the IDs of posts are kept; at least one more than devices keep posts")
+      ->check(CLI::Range(0.0, 3650.0));
+  option(app, "--keep-days", given.keepDays, "DAYS", "Days for which everything else is kept; 0: for ever")
+      ->check(CLI::Range(0.0, 36500.0));
 }
 
 }  // namespace
@@ -159,11 +120,11 @@ void describe(CLI::App& app, Arguments& given) {
   app.set_version_flag("--version", std::string("veltra-gateway ") + kVersion, "Print the version");
   app.require_subcommand(0, 1);
   describeStream(app, given.stream);
-  describeServing(app, given.serve);
+  describeServing(app, given.serve, given.stream);
   CLI::App* drain =
       app.add_subcommand("drain", "Write what the stream holds to PostgreSQL")->group("Commands");
   describeStream(*drain, given.stream);
-  describeDrain(*drain, given);
+  describeDrain(*drain, given.drain);
   drain->callback([&given] { given.drains = true; });
   app.footer(kFooter);
 }

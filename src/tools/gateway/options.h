@@ -2,29 +2,19 @@
 // The command line of veltra-gateway.
 #pragma once
 
-#include <cstdint>
+#include <cstddef>
 #include <string>
-#include <vector>
 
+#include "gateway/nats_connection.h"
 #include "tools/command_line.h"
 
 namespace veltrad::gateway {
-
-struct StreamArguments {
-  std::vector<std::string> servers{"nats://127.0.0.1:4222"};
-  std::string name = "VELTRA";
-  std::string prefix = "veltra.";
-  std::string credentials;
-  std::string ca;
-};
 
 struct ServeArguments {
   std::string listen = "127.0.0.1:8080";
   std::string admin = "127.0.0.1:8081";
   // Empty: no datagrams are taken.
   std::string dashboard;
-  int copies = 3;
-  std::int64_t streamBytes = 0;
   double hold = 15;
   std::size_t holdBytes = 256u << 20;
   std::size_t holdMessages = 16'384;
@@ -45,7 +35,7 @@ struct DrainArguments {
 };
 
 struct Arguments {
-  StreamArguments stream;
+  StreamOptions stream;
   ServeArguments serve;
   DrainArguments drain;
   bool drains = false;

@@ -47,6 +47,14 @@ std::optional<PiecePlace> placeIn(std::string_view text) {
   return place;
 }
 
+// As far as the folder can be read.
+template <typename Visit>
+void eachIn(const fs::path& folder, const Visit& visit) {
+  std::error_code error;
+  for (fs::directory_iterator entry(folder, error), end; !error && entry != end; entry.increment(error))
+    visit(entry->path());
+}
+
 Failure<StoreError> failureOfFile(const std::string& path) {
   return passingFailure(path + ": " + std::strerror(errno));
 }
@@ -62,25 +70,20 @@ Result<Done, StoreError> PieceStore::open() {
 }
 
 void PieceStore::forgetUnfinished(std::int64_t read) {
-  std::error_code error;
-  for (const auto& entry : fs::directory_iterator(fs::path(_folder) / "incoming", error)) {
+  eachIn(fs::path(_folder) / "incoming", [read](const fs::path& path) {
     struct stat found {};
-    if (::stat(entry.path().c_str(), &found) == 0 &&
-        found.st_mtim.tv_sec < read / kPerSecond - kForgottenAfter)
-      ::unlink(entry.path().c_str());
-  }
+    if (::stat(path.c_str(), &found) == 0 && found.st_mtim.tv_sec < read / kPerSecond - kForgottenAfter)
+      ::unlink(path.c_str());
+  });
 }
 
 void PieceStore::forgetDaysBefore(std::string_view day) {
-  std::error_code error;
-  for (const auto& entry : fs::directory_iterator(_folder, error)) {
-    const std::string name = entry.path().filename().string();
-    if (name.size() != kDayLength || name.find_first_not_of("0123456789-") != std::string::npos ||
-        name >= day)
-      continue;
-    std::error_code passing;
-    fs::remove_all(entry.path(), passing);
-  }
+  eachIn(_folder, [day](const fs::path& path) {
+    const std::string name = path.filename().string();
+    std::error_code ignored;
+    if (name.size() == kDayLength && name.find_first_not_of("0123456789-") == std::string::npos && name < day)
+      fs::remove_all(path, ignored);
+  });
 }
 
 Result<Done, StoreError> PieceStore::write(std::string_view place, std::string_view bytes,

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The folder of files: what has come of bodies in pieces, below "incoming", and whole files, in a folder for
-// each day.
+// The folder of files: incomplete bodies in pieces below "incoming", and whole files in a folder for each
+// day.
 #pragma once
 
 #include <cstdint>
@@ -34,7 +34,7 @@ class PieceStore {
   // of the message's time. Without a place `last` is all of it.
   Result<std::string, StoreError> keep(std::string_view place, std::string_view last, const std::string& name,
                                        std::int64_t time);
-  // What was written is on the disk when it returns.
+  // Syncs everything that was written to the disk.
   Result<Done, StoreError> sync();
   // After the commit of what the pieces have become.
   void forget(std::string_view place);

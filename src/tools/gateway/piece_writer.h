@@ -15,7 +15,7 @@ namespace veltrad::gateway {
 
 // Less than 1 MiB, which a server of the stream takes unless it is told otherwise.
 inline constexpr std::size_t kPieceBytes = 960u << 10;
-// Of one body that comes slower than it is published.
+// The number of unconfirmed pieces of one body.
 inline constexpr std::size_t kMostPiecesUnderWay = 2;
 
 // One thread adds and commits; answers come on others. The publisher must outlive it.
@@ -27,10 +27,10 @@ class PieceWriter {
   void add(std::string_view bytes);
   // False: several pieces wait for the stream. `resume` is then called once, when fewer do.
   bool hasRoom(std::function<void()> resume);
-  // The worst of what became of the pieces so far.
+  // The worst outcome of the pieces so far.
   Outcome outcome() const;
-  // `last` has everything but the body. `done` is told what became of the whole; it has the stream's word for
-  // every piece before it publishes the last one.
+  // `last` has everything except the body. `done` gets the outcome of the whole body. The last piece is
+  // published only after the stream has confirmed all others.
   void commit(Message last, Publisher::Completion done);
 
  private:

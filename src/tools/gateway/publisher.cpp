@@ -2,7 +2,7 @@
 // Publishes what is due and completes what was answered or is too late.
 #include "gateway/publisher.h"
 
-#include "base/text.h"
+#include "gateway/attempt.h"
 #include "platform/log.h"
 
 namespace veltrad::gateway {
@@ -41,25 +41,15 @@ Publisher::~Publisher() {
 }
 
 void Publisher::publish(Message message, Completion completion) {
-  const auto begun = std::chrono::steady_clock::now();
-  // A shared function, because what could not be added is still to be called.
-  auto shared = std::make_shared<Completion>(std::move(completion));
   bool added = false;
-  {
+  const bool found = attempt([&] {
     const Lock hold(_mutex);
-    added = !_stopping && _held.add(
-                              std::move(message),
-                              [shared, begun, &metrics = _metrics](Outcome outcome) {
-                                if (outcome == Outcome::taken)
-                                  metrics.published(std::chrono::steady_clock::now() - begun);
-                                (*shared)(outcome);
-                              },
-                              begun);
-  }
+    added = !_stopping && _held.add(std::move(message), completion, std::chrono::steady_clock::now());
+  });
   if (added)
     _changed.notifyOne();
   else
-    (*shared)(Outcome::full);
+    completion(found ? Outcome::full : Outcome::shortage);
 }
 
 void Publisher::endBy(HeldMessages::Time end) {
@@ -76,43 +66,45 @@ std::size_t Publisher::held() const {
 }
 
 void Publisher::answered(std::uint64_t token, const std::string& why) {
-  std::vector<Completion> completions;
+  const auto now = std::chrono::steady_clock::now();
+  std::vector<HeldMessages::Waiter> waiters;
   {
     const Lock hold(_mutex);
     if (why.empty())
-      completions = _held.taken(token);
+      waiters = _held.taken(token);
     else
-      _held.refused(token, std::chrono::steady_clock::now());
+      _held.refused(token, now);
   }
-  if (!why.empty()) {
-    if (const auto line = _refusals.happened("stream: a message was not taken: " + why))
-      logWarning("%s", line->c_str());
-    _changed.notifyOne();
+  for (const auto& waiter : waiters) {
+    _metrics.published(now - waiter.since);
+    attempt([&] { waiter.completion(Outcome::taken); });
   }
-  for (const Completion& completion : completions) completion(Outcome::taken);
+  if (why.empty()) return;
+  _changed.notifyOne();
+  if (const auto line = _refusals.happened("stream: a message was not taken: " + why))
+    logWarning("%s", line->c_str());
 }
 
 void Publisher::run() {
   for (;;) {
-    std::vector<HeldMessages::Due> due;
-    std::vector<Completion> late;
-    bool ends = false;
+    std::vector<HeldMessages::Waiter> late;
+    std::optional<HeldMessages::Due> due;
     {
       const Lock hold(_mutex);
       const auto now = std::chrono::steady_clock::now();
       late = _held.expired(now);
-      due = _held.due(now);
-      ends = _stopping && late.empty();
-      if (late.empty() && due.empty() && !ends) {
+      if (late.empty()) due = _held.due(now);
+      if (late.empty() && !due) {
+        if (_stopping) return;
         if (const auto next = _held.next())
           _changed.waitUntil(_mutex, *next);
         else
           _changed.wait(_mutex);
       }
     }
-    if (ends) return;
-    for (const Completion& completion : late) completion(Outcome::late);
-    for (const auto& [token, message] : due) _stream->publish(token, *message);
+    for (const auto& waiter : late) attempt([&] { waiter.completion(Outcome::late); });
+    // It is due again if there is no memory for it now.
+    if (due) attempt([&] { _stream->publish(due->token, *due->message); });
   }
 }
 

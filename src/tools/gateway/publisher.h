@@ -24,8 +24,8 @@ class Publisher {
   // Completes everything that is held as late.
   ~Publisher();
 
-  // The completion is called once: on this thread if there is no room, else on another one. It must not
-  // block.
+  // The completion is called once: on this thread if there is no room or no memory, else on another one. It
+  // must not block, and ends where it finds no memory.
   void publish(Message message, Completion completion);
   // From now on nothing is held beyond `end`.
   void endBy(HeldMessages::Time end);

@@ -2,6 +2,8 @@
 // Makes answers without a body, because a daemon may take any body for a receipt.
 #include "gateway/refusals.h"
 
+#include <fmt/format.h>
+
 #include "base/text.h"
 #include "platform/uuid.h"
 
@@ -11,7 +13,7 @@ namespace {
 
 constexpr const char* kRefusedHeader = "X-VLT-Refused";
 constexpr std::size_t kMostDetailBytes = 512;
-// Seconds; the random part spreads those who come back.
+// Seconds; the random part spreads the repeated requests.
 constexpr unsigned kRetryAfter = 5;
 constexpr unsigned kRetrySpread = 10;
 
@@ -38,9 +40,9 @@ bool Refusals::isKept() {
 }
 
 Answer Refusals::answer(const Refusal& refusal) {
-  _metrics.refused.add(refusal.reason);
   Answer answer{refusal.status, "", "", {{kRefusedHeader, asHeader(refusal.detail)}}};
   if (refusal.status == 405) answer.headers.emplace_back("Allow", "POST");
+  _metrics.refused.add(refusal.reason);
   return answer;
 }
 
@@ -56,10 +58,29 @@ Answer Refusals::malformed(const char* reason, const std::string& detail, std::s
   return answer({400, reason, std::string(reason) + ": " + detail});
 }
 
+Answer Refusals::gzip(support::Gunzip::State state, std::uint64_t most, std::string_view body) {
+  switch (state) {
+    case support::Gunzip::State::shortage:
+      return busy("no_memory");
+    case support::Gunzip::State::tooLarge:
+      return answer(
+          {413, "too_large",
+           fmt::format("the body unpacks to more than {} bytes, or to far more than what came", most)});
+    case support::Gunzip::State::tail:
+      return malformed("gzip", "bytes follow the gzip stream", body);
+    case support::Gunzip::State::open:
+      return malformed("gzip", "the gzip stream is cut short", body);
+    default:
+      return malformed("gzip", "it is no gzip stream", body);
+  }
+}
+
 Answer Refusals::busy(const char* reason) {
-  _metrics.refused.add(reason);
   const unsigned spread = platform::randomUUID()[0] % kRetrySpread;
-  return {_shed, "", "", {{kRefusedHeader, reason}, {"Retry-After", std::to_string(kRetryAfter + spread)}}};
+  Answer answer{
+      _shed, "", "", {{kRefusedHeader, reason}, {"Retry-After", std::to_string(kRetryAfter + spread)}}};
+  _metrics.refused.add(reason);
+  return answer;
 }
 
 }  // namespace veltrad::gateway

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers that refuse: counts them, and keeps apart what was malformed.
+// Makes refusing answers, counts them, and stores malformed bodies separately.
 #pragma once
 
 #include <chrono>
@@ -10,6 +10,7 @@
 #include "base/mutex.h"
 #include "gateway/http_server.h"
 #include "gateway/publisher.h"
+#include "support/gunzip.h"
 
 namespace veltrad::gateway {
 
@@ -45,6 +46,9 @@ class Refusals {
   Answer answer(const Refusal& refusal);
   // The same for a body that is malformed, which is kept apart.
   Answer malformed(const char* reason, const std::string& detail, std::string_view body);
+  // For a gzip stream that is not as it should be: cut short if its state is "open". `most`: what it may
+  // unpack to.
+  Answer gzip(support::Gunzip::State state, std::uint64_t most, std::string_view body);
   // For what the stream has not taken, or that there is no room for.
   Answer busy(const char* reason);
 

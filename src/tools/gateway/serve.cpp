@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts the gateway's parts together and takes them apart in order.
+// Constructs the parts of the gateway and stops them in order.
 #include "gateway/serve.h"
 
 #include <sys/resource.h>
@@ -12,8 +12,8 @@
 
 #include "formats/json.h"
 #include "gateway/admin.h"
-#include "gateway/datagram_door.h"
-#include "gateway/door.h"
+#include "gateway/datagram_receiver.h"
+#include "gateway/request_router.h"
 #include "gateway/work_queue.h"
 #include "platform/service_manager.h"
 
@@ -21,7 +21,7 @@ namespace veltrad::gateway {
 
 namespace {
 
-// What has begun is answered until then.
+// Open requests are answered until then.
 constexpr std::chrono::seconds kLongestStop{10};
 // The process ends then, whatever still blocks: what was confirmed is in the stream, or in the tables.
 constexpr unsigned kLongestEndSeconds = 14;
@@ -64,15 +64,12 @@ BodyBounds bodyBounds(const ServeArguments& given) {
   return bounds;
 }
 
-Admin::Questions questionsTo(const Publisher& publisher, Metrics& metrics, HTTPServer& server) {
+Admin::Questions questionsTo(const Publisher& publisher, const Metrics& metrics, HTTPServer& server) {
   return {[&publisher, &server]() -> std::string {
             if (!publisher.ready()) return "the stream is not there";
             return server.answersWithin(kLongestTurn) ? "" : "requests are not being served";
           },
-          [&publisher, &metrics, &server] {
-            metrics.connections = static_cast<std::int64_t>(server.connections());
-            return metrics.text(publisher.held());
-          }};
+          [&publisher, &metrics, &server] { return metrics.text(server.connections(), publisher.held()); }};
 }
 
 }  // namespace
@@ -101,36 +98,24 @@ void sayReady(const Dictionary& line) {
   platform::ServiceManager().ready();
 }
 
-StreamOptions streamOptions(const StreamArguments& given) {
-  StreamOptions options;
-  options.servers = given.servers;
-  options.name = given.name;
-  options.prefix = given.prefix;
-  options.credentials = given.credentials;
-  options.ca = given.ca;
-  return options;
-}
-
 int serve(const Arguments& given) {
   blockStopSignals();
   raiseDescriptorLimit();
   Metrics metrics;
-  StreamOptions stream = streamOptions(given.stream);
-  stream.copies = given.serve.copies;
-  stream.mostBytes = given.serve.streamBytes;
-  auto opened = Publisher::open(stream, heldBounds(given.serve), metrics);
+  auto opened = Publisher::open(given.stream, heldBounds(given.serve), metrics);
   if (!opened) return failed(opened.error());
   // Destroyed first, so that no completion comes after what it uses.
   std::unique_ptr<Publisher> publisher = std::move(opened).value();
   WorkQueue bodies;
   if (!bodies.start()) return failed("a thread cannot be started");
-  Door door(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
-            [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
-  HTTPServer server([&door](const RequestHead& head) { return door.request(head); },
-                    {.connections = given.serve.connections});
+  RequestRouter router(*publisher, metrics, bodyBounds(given.serve), given.serve.shed,
+                       [&bodies](WorkQueue::Work work) { bodies.add(std::move(work)); });
+  HTTPServer server([&router](const RequestHead& head) { return router.request(head); },
+                    {.connections = given.serve.connections, .shortage = given.serve.shed},
+                    [&metrics] { metrics.refused.add("no_memory"); });
   const auto listen = server.listen(given.serve.listen);
   if (!listen) return failed("--listen " + listen.error());
-  DatagramDoor datagrams(*publisher, metrics, given.serve.holdMessages / 2);
+  DatagramReceiver datagrams(*publisher, metrics, given.serve.holdMessages / 2);
   Dictionary line{{"listen", asURL(listen.value())}, {"pid", static_cast<long>(::getpid())}};
   if (!given.serve.dashboard.empty()) {
     const auto bound = datagrams.start(given.serve.dashboard);

@@ -5,7 +5,6 @@
 #include <string>
 
 #include "base/value.h"
-#include "gateway/nats_connection.h"
 #include "tools/gateway/options.h"
 
 namespace veltrad::gateway {
@@ -17,12 +16,10 @@ void blockStopSignals();
 void awaitStop();
 // The address of a listener as the line names it.
 std::string asURL(const std::string& address);
-// One JSON line on standard output, and the word to the service manager.
+// Prints one JSON line on standard output, and notifies the service manager.
 void sayReady(const Dictionary& line);
 
-StreamOptions streamOptions(const StreamArguments& given);
-
-// Both return the exit status, and have said on standard error why it is not 0.
+// Both return the exit status; if it is not 0, the reason was printed on standard error.
 int serve(const Arguments& given);
 int drain(const Arguments& given);
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Why the drain could not store something.
+// The error of a failed attempt of the drain to store something.
 #pragma once
 
 #include <string>

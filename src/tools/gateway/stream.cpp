@@ -11,6 +11,7 @@
 #include <string_view>
 
 #include "formats/json.h"
+#include "gateway/attempt.h"
 #include "platform/log.h"
 #include "platform/uuid.h"
 
@@ -75,7 +76,8 @@ void Stream::Link::answered(natsConnection*, natsSubscription*, natsMsg* answer,
   std::uint64_t token = 0;
   if (subject.size() > self->inbox.size())
     std::from_chars(subject.data() + self->inbox.size(), subject.data() + subject.size(), token);
-  self->listener.answered(token, refusalIn(answer));
+  // An answer that there is no memory for comes again, because its message does.
+  attempt([&] { self->listener.answered(token, refusalIn(answer)); });
   natsMsg_Destroy(answer);
 }
 
@@ -199,19 +201,22 @@ std::string Stream::faultOfStream() {
   return detail && *detail ? detail : natsStatus_GetText(status);
 }
 
+void Stream::look() {
+  const std::string fault = faultOfStream();
+  const bool was = _ready.exchange(fault.empty());
+  if (fault != _said) {
+    if (fault.empty())
+      logInfo("stream: %s is ready", _options.name.c_str());
+    else
+      logWarning("stream: %s is not there: %s", _options.name.c_str(), fault.c_str());
+  }
+  _said = fault;
+  if (fault.empty() && !was) _listener.back();
+}
+
 void Stream::watch() {
-  std::optional<std::string> said;
   for (;;) {
-    const std::string fault = faultOfStream();
-    const bool was = _ready.exchange(fault.empty());
-    if (fault != said) {
-      if (fault.empty())
-        logInfo("stream: %s is ready", _options.name.c_str());
-      else
-        logWarning("stream: %s is not there: %s", _options.name.c_str(), fault.c_str());
-    }
-    said = fault;
-    if (fault.empty() && !was) _listener.back();
+    attempt([this] { look(); });
     const Lock hold(_mutex);
     if (!_stopping) _changed.waitUntil(_mutex, std::chrono::steady_clock::now() + std::chrono::seconds(1));
     if (_stopping) return;

@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
-// The stream, as those use it who put messages into it.
+// The publishing side of the stream.
 #pragma once
 
 #include <atomic>
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -47,6 +48,7 @@ class Stream {
   Stream(StreamOptions options, Listener listener);
   std::shared_ptr<Link> link();
   void watch();
+  void look();
   // Makes another connection where this one is over.
   void renew();
   // Why the stream is not there, as one line; empty: it is.
@@ -56,6 +58,8 @@ class Stream {
   const Listener _listener;
   platform::LimitedLine _unpublished{"messages"};
   std::atomic<bool> _ready{false};
+  // The fault that the log knows; absent: nothing was said yet. Of the watching thread.
+  std::optional<std::string> _said;
   Mutex _mutex LEAF_LOCK{LockRank::leaf};
   Condition _changed;
   std::shared_ptr<Link> _link GUARDED_BY(_mutex);

@@ -38,6 +38,11 @@ struct FreeMetaData {
   void operator()(jsMsgMetaData* data) const { jsMsgMetaData_Destroy(data); }
 };
 
+struct MessageList : natsMsgList {
+  MessageList() : natsMsgList{} {}
+  ~MessageList() { natsMsgList_Destroy(this); }
+};
+
 }  // namespace
 
 Result<std::unique_ptr<StreamReader>, std::string> StreamReader::open(StreamOptions options) {
@@ -93,36 +98,35 @@ Result<Done, std::string> StreamReader::startBehind(std::uint64_t seq) {
   return Done();
 }
 
-Result<std::vector<Taken>, std::string> StreamReader::read(int most) {
-  natsMsgList list{};
+Result<std::vector<StreamMessage>, std::string> StreamReader::read(int most) {
+  MessageList list;
   jsFetchRequest wanted;
   jsFetchRequest_Init(&wanted);
   wanted.Batch = most;
   wanted.MaxBytes = kMostBytesAtOnce;
   wanted.Expires = kWaitNanoseconds;
   const natsStatus status = natsSubscription_FetchRequest(&list, _subscription, &wanted);
-  if (status == NATS_TIMEOUT && _connection->connected()) return std::vector<Taken>();
+  if (status == NATS_TIMEOUT && _connection->connected()) return std::vector<StreamMessage>();
   if (status != NATS_OK)
     return Failure{failureOf("the stream cannot be read", status, static_cast<jsErrCode>(0))};
-  std::vector<Taken> taken;
+  std::vector<StreamMessage> taken;
   taken.reserve(static_cast<std::size_t>(list.Count));
-  std::optional<std::string> fault;
-  for (int at = 0; at < list.Count && !fault; ++at) fault = add(list.Msgs[at], taken);
-  natsMsgList_Destroy(&list);
-  if (fault) return Failure{std::move(*fault)};
+  for (int at = 0; at < list.Count; ++at) {
+    if (auto fault = add(list.Msgs[at], taken)) return Failure{std::move(*fault)};
+  }
   return taken;
 }
 
-std::optional<std::string> StreamReader::add(natsMsg* message, std::vector<Taken>& taken) {
+std::optional<std::string> StreamReader::add(natsMsg* message, std::vector<StreamMessage>& taken) {
   jsMsgMetaData* found = nullptr;
   if (natsMsg_GetMetaData(&found, message) != NATS_OK) return "a message without its place in the stream";
   const std::unique_ptr<jsMsgMetaData, FreeMetaData> data(found);
-  // What was delivered and did not arrive is not delivered again.
+  // Delivered messages that did not arrive are not delivered again.
   if (data->Sequence.Consumer != _delivered + 1)
     return fmt::format("delivery {} came behind delivery {}", data->Sequence.Consumer, _delivered);
   _delivered = data->Sequence.Consumer;
   _behind = data->NumPending;
-  Taken one;
+  StreamMessage one;
   one.seq = data->Sequence.Stream;
   one.time = data->Timestamp;
   one.subject = std::string(natsMsg_GetSubject(message)).substr(_options.prefix.size());

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The stream, as the drain reads it: in order, from a given place.
+// Reads the stream in order, from a given place.
 #pragma once
 
 #include <cstdint>
@@ -17,7 +17,7 @@ struct __natsMsg;
 namespace veltrad::gateway {
 
 // A message as the stream has it. Headers that it does not have are empty.
-struct Taken {
+struct StreamMessage {
   std::uint64_t seq = 0;
   // Nanoseconds since 1970.
   std::int64_t time = 0;
@@ -47,7 +47,7 @@ class StreamReader {
   Result<Done, std::string> startBehind(std::uint64_t seq);
   // The next messages, at most `most` and about 32 MiB; none if nothing has come within a second. An error,
   // also one for a gap, asks for a new start.
-  Result<std::vector<Taken>, std::string> read(int most);
+  Result<std::vector<StreamMessage>, std::string> read(int most);
   // The time of the message at this place, in nanoseconds since 1970; absent: there is none.
   Result<std::optional<std::int64_t>, std::string> timeAt(std::uint64_t seq);
   // The stream may forget everything up to `seq`.
@@ -58,7 +58,7 @@ class StreamReader {
  private:
   explicit StreamReader(StreamOptions options) : _options(std::move(options)) {}
   void leaveConsumer();
-  std::optional<std::string> add(__natsMsg* message, std::vector<Taken>& taken);
+  std::optional<std::string> add(__natsMsg* message, std::vector<StreamMessage>& taken);
 
   const StreamOptions _options;
   std::unique_ptr<NATSConnection> _connection;

@@ -126,7 +126,7 @@ void TableRows::clear() {
     std::string().swap(*rows);
 }
 
-Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string body) {
+Result<Done, std::string> TableRows::addEvents(const StreamMessage& message, std::string body) {
   const auto envelope = parseEnvelope(std::move(body));
   if (!envelope) return Failure{envelope.error()};
   std::int64_t index = 0;
@@ -146,7 +146,7 @@ Result<Done, std::string> TableRows::addEvents(const Taken& message, std::string
   return Done();
 }
 
-Result<Done, std::string> TableRows::addDatagram(const Taken& message) {
+Result<Done, std::string> TableRows::addDatagram(const StreamMessage& message) {
   const auto parsed = parseCleanJSON(message.body);
   const Dictionary* fields = parsed ? parsed.value().asDictionary() : nullptr;
   const std::string* text = fields ? fields->string("text") : nullptr;
@@ -160,7 +160,7 @@ Result<Done, std::string> TableRows::addDatagram(const Taken& message) {
   return Done();
 }
 
-Result<Done, std::string> TableRows::addLogData(const Taken& message, std::string body) {
+Result<Done, std::string> TableRows::addLogData(const StreamMessage& message, std::string body) {
   if (message.location.empty()) return Failure{std::string("log data without a location")};
   CopyRow(logData)
       .time(message.time)
@@ -170,7 +170,7 @@ Result<Done, std::string> TableRows::addLogData(const Taken& message, std::strin
   return Done();
 }
 
-Result<Done, std::string> TableRows::addFile(const Taken& message, const std::string& path) {
+Result<Done, std::string> TableRows::addFile(const StreamMessage& message, const std::string& path) {
   const auto parsed = parseCleanJSON(message.file);
   const Dictionary* file = parsed ? parsed.value().asDictionary() : nullptr;
   if (!file) return Failure{std::string("a file without its description")};
@@ -181,7 +181,7 @@ Result<Done, std::string> TableRows::addFile(const Taken& message, const std::st
   return Done();
 }
 
-void TableRows::addRefused(const Taken& message, const std::string& reason) {
+void TableRows::addRefused(const StreamMessage& message, const std::string& reason) {
   CopyRow(refused)
       .time(message.time)
       .number(static_cast<std::int64_t>(message.seq))

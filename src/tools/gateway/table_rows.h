@@ -14,11 +14,12 @@
 
 namespace veltrad::gateway {
 
-// Writes one row, column by column.
+// Writes one row behind those that are there, column by column.
 class CopyRow {
  public:
-  explicit CopyRow(std::string& out) : _out(out) {}
-  ~CopyRow() { _out += '\n'; }
+  explicit CopyRow(std::string& out) : _out(out) {
+    if (!_out.empty()) _out += '\n';
+  }
   CopyRow(const CopyRow&) = delete;
 
   CopyRow& text(std::string_view text);
@@ -55,11 +56,11 @@ struct TableRows {
   void clear();
 
   // Each adds the rows of one message; the error says why it has none. `body` is the message's whole body.
-  Result<Done, std::string> addEvents(const Taken& message, std::string body);
-  Result<Done, std::string> addDatagram(const Taken& message);
-  Result<Done, std::string> addLogData(const Taken& message, std::string body);
-  Result<Done, std::string> addFile(const Taken& message, const std::string& path);
-  void addRefused(const Taken& message, const std::string& reason);
+  Result<Done, std::string> addEvents(const StreamMessage& message, std::string body);
+  Result<Done, std::string> addDatagram(const StreamMessage& message);
+  Result<Done, std::string> addLogData(const StreamMessage& message, std::string body);
+  Result<Done, std::string> addFile(const StreamMessage& message, const std::string& path);
+  void addRefused(const StreamMessage& message, const std::string& reason);
 };
 
 }  // namespace veltrad::gateway

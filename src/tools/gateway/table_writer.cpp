@@ -17,7 +17,7 @@ constexpr const char* kTryLock =
     "SELECT pg_try_advisory_lock(hashtext('veltra-gateway drain'), hashtext($1))";
 // Rows are copied when they have grown to this, all in one transaction.
 constexpr std::size_t kMostRowBytes = 16u << 20;
-// Of an index that is made for rows that are there, and of forgetting.
+// The limit for making an index over existing rows, and for deleting old rows.
 constexpr std::chrono::minutes kLongestHousekeeping{30};
 
 // Only digits of IDs get into statements.
@@ -61,21 +61,22 @@ Result<TableWriter::Position, StoreError> TableWriter::position(std::int64_t cre
   return Position{_position, std::stoll(found.substr(found.find(' ') + 1))};
 }
 
-Result<TableWriter::Written, StoreError> TableWriter::write(const std::vector<Taken>& messages) {
+Result<TableWriter::Written, StoreError> TableWriter::write(const std::vector<StreamMessage>& messages) {
   if (messages.empty()) return Written();
   return writeHalves(messages.data(), messages.data() + messages.size());
 }
 
-Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const Taken* begin, const Taken* end) {
+Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const StreamMessage* begin,
+                                                                  const StreamMessage* end) {
   auto written = writeTogether(begin, end, "");
   if (written || written.error().kind != StoreError::Kind::data) return written;
-  // One of them cannot be stored as it is: it is found in few transactions, and kept in another table.
+  // One message cannot be stored: it is found in few transactions, and kept in another table.
   if (end - begin == 1) {
     written = writeTogether(begin, end, "drain: " + written.error().detail);
     if (written) written.value().refused = 1;
     return written;
   }
-  const Taken* middle = begin + (end - begin) / 2;
+  const StreamMessage* middle = begin + (end - begin) / 2;
   auto first = writeHalves(begin, middle);
   if (!first) return first;
   written = writeHalves(middle, end);
@@ -85,7 +86,8 @@ Result<TableWriter::Written, StoreError> TableWriter::writeHalves(const Taken* b
                  first.value().refused + written.value().refused};
 }
 
-Result<TableWriter::Written, StoreError> TableWriter::writeTogether(const Taken* begin, const Taken* end,
+Result<TableWriter::Written, StoreError> TableWriter::writeTogether(const StreamMessage* begin,
+                                                                    const StreamMessage* end,
                                                                     const std::string& refusal) {
   if (auto begun = _database->run("BEGIN"); !begun) return Failure{begun.error()};
   const auto undo = [this](StoreError error) {
@@ -107,10 +109,10 @@ Result<TableWriter::Written, StoreError> TableWriter::writeTogether(const Taken*
   return Written{batch.value().rows.eventCount, batch.value().skipped, 0};
 }
 
-Result<Batch, StoreError> TableWriter::batchOf(const Taken* begin, const Taken* end,
+Result<Batch, StoreError> TableWriter::batchOf(const StreamMessage* begin, const StreamMessage* end,
                                                std::set<std::string> seen, const std::string& refusal) {
   Batch batch;
-  for (const Taken* message = begin; message != end; ++message) {
+  for (const StreamMessage* message = begin; message != end; ++message) {
     const bool hasID = hasPostID(message->postID);
     const bool isPiece = message->subject == subject::kPieces;
     if (!message->piece.empty() && !isPiece) batch.places.push_back(message->piece);
@@ -131,7 +133,7 @@ Result<Batch, StoreError> TableWriter::batchOf(const Taken* begin, const Taken* 
   return batch;
 }
 
-Result<Done, StoreError> TableWriter::add(const Taken& message, TableRows& rows) {
+Result<Done, StoreError> TableWriter::add(const StreamMessage& message, TableRows& rows) {
   const auto asData = [](Result<Done, std::string> added) -> Result<Done, StoreError> {
     if (added) return Done();
     return dataFailure(added.error());
@@ -156,9 +158,10 @@ Result<Done, StoreError> TableWriter::add(const Taken& message, TableRows& rows)
                                                     : rows.addLogData(message, std::move(body).value()));
 }
 
-Result<std::set<std::string>, StoreError> TableWriter::knownPosts(const Taken* begin, const Taken* end) {
+Result<std::set<std::string>, StoreError> TableWriter::knownPosts(const StreamMessage* begin,
+                                                                  const StreamMessage* end) {
   std::string ids;
-  for (const Taken* message = begin; message != end; ++message) {
+  for (const StreamMessage* message = begin; message != end; ++message) {
     if (hasPostID(message->postID)) ids += (ids.empty() ? "'\\x" : ",'\\x") + message->postID + "'::bytea";
   }
   std::set<std::string> known;

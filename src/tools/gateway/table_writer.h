@@ -15,7 +15,7 @@
 
 namespace veltrad::gateway {
 
-// A batch in the making: its rows, and what is to be done after its commit.
+// A batch under construction: its rows, and the work after its commit.
 struct Batch {
   TableRows rows;
   // The pieces that are not needed any more.
@@ -34,7 +34,7 @@ class TableWriter {
     std::uint64_t refused = 0;
   };
 
-  // Takes the place of the one drain of the stream that is active: false if another has it.
+  // Makes this the active drain of the stream; false if another drain is active.
   static Result<bool, StoreError> becomeActive(Database& database, const std::string& stream);
   // Makes what is missing of tables and views, unless this version of them is there: a statement that
   // replaces a view would wait for every query of it, and let others wait meanwhile.
@@ -52,21 +52,22 @@ class TableWriter {
 
   // A stream that was made at another time begins at 0.
   Result<Position, StoreError> position(std::int64_t created);
-  // What the stream takes next gets places behind `seq`, which is lower than the position.
+  // Sets the position back to `seq`, because new messages of the stream get the places after it.
   Result<Done, StoreError> goBack(std::uint64_t seq);
   // After an error nothing is written, unless the error came with the commit: ask for the position then.
-  Result<Written, StoreError> write(const std::vector<Taken>& messages);
-  // Forgets what is older: IDs of posts, and everything else unless `keepDays` is 0.
+  Result<Written, StoreError> write(const std::vector<StreamMessage>& messages);
+  // Deletes older data: IDs of posts, and everything else unless `keepDays` is 0.
   Result<Done, StoreError> forget(double postDays, double keepDays);
 
  private:
-  Result<Written, StoreError> writeHalves(const Taken* begin, const Taken* end);
+  Result<Written, StoreError> writeHalves(const StreamMessage* begin, const StreamMessage* end);
   // With a refusal the messages go to "refused" for this reason.
-  Result<Written, StoreError> writeTogether(const Taken* begin, const Taken* end, const std::string& refusal);
-  Result<Batch, StoreError> batchOf(const Taken* begin, const Taken* end, std::set<std::string> seen,
-                                    const std::string& refusal);
-  Result<Done, StoreError> add(const Taken& message, TableRows& rows);
-  Result<std::set<std::string>, StoreError> knownPosts(const Taken* begin, const Taken* end);
+  Result<Written, StoreError> writeTogether(const StreamMessage* begin, const StreamMessage* end,
+                                            const std::string& refusal);
+  Result<Batch, StoreError> batchOf(const StreamMessage* begin, const StreamMessage* end,
+                                    std::set<std::string> seen, const std::string& refusal);
+  Result<Done, StoreError> add(const StreamMessage& message, TableRows& rows);
+  Result<std::set<std::string>, StoreError> knownPosts(const StreamMessage* begin, const StreamMessage* end);
   Result<Done, StoreError> copyRows(const TableRows& rows);
   Result<Done, StoreError> advance(Position to);
   Result<Done, StoreError> forgetNow(double postDays, double keepDays);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Runs what would be a long turn of the thread that serves everybody on a thread of its own.
+// Runs long tasks on a separate thread, so that they do not delay the serving thread.
 #pragma once
 
 #include <deque>
@@ -10,7 +10,7 @@
 
 namespace veltrad::gateway {
 
-// One work after the other, in their order. What waits is bounded by those who hand it over.
+// Runs tasks one after the other, in order. The callers limit the number of waiting tasks.
 class WorkQueue {
  public:
   using Work = std::function<void()>;

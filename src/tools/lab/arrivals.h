@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What arrives at the lab, by kind. Any thread.
+// The arrivals at the lab, by kind. Any thread.
 #pragma once
 
 #include <array>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The rules for the lab's misbehaviour, each for the requests below a path. Any thread.
+// The rules by which the lab misbehaves, each for the requests below a path. Any thread.
 #pragma once
 
 #include <chrono>
@@ -42,7 +42,7 @@ struct Rule {
   bool stall = false;
   bool endless = false;
   Signature sign = Signature::right;
-  // Of a storebag that is signed right.
+  // The changes to a correctly signed storebag.
   std::optional<Stamp> bag;
   Acknowledgement acknowledgement = Acknowledgement::right;
   // Whether there is a "Last-Modified" header.

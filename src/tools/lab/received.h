@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What has arrived: one JSON object per line in received/KIND.jsonl, and the newest lines in memory. Any
+// Stores arrivals: one JSON object per line in received/KIND.jsonl, and the newest lines in memory. Any
 // thread.
 #pragma once
 

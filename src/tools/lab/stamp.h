@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the lab puts on a storebag that it serves, and with which keys it signs it: the "bag" of a rule.
+// The changes that the lab makes to a served storebag, and the keys that sign it: the "bag" of a rule.
 #pragma once
 
 #include <cstdint>
@@ -28,9 +28,9 @@ struct Stamp {
   std::optional<std::string> name;
   // Names of keys, both of which are revoked, or fingerprints.
   std::optional<std::vector<std::string>> revoked;
-  // Whose RSA key signs.
+  // The name of the RSA key that signs.
   std::string key = kOwnKeys;
-  // Whose Ed25519 keys sign as well.
+  // The names of the Ed25519 keys that also sign.
   std::vector<std::string> ed25519{kOwnKeys};
 };
 

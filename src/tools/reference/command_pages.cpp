@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the manual pages of the programs say about their options and commands.
+// Generates the parts of manual pages about options and commands.
 #include "tools/reference/command_pages.h"
 
 #include <fmt/format.h>
@@ -59,7 +59,7 @@ std::string usage(const CommandLine& line, const std::string& path) {
 
 using Groups = std::vector<std::pair<std::string, const CommandLine*>>;
 
-// Those that `line` has, which are noted down at the first command that has them.
+// The groups of options of `line`, which are recorded at the first command that has them.
 std::string groupsOf(const CommandLine& line, Groups& groups) {
   std::string names;
   for (const Argument& argument : line.arguments) {

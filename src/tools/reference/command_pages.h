@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the manual pages of the programs say about their options and commands.
+// Generates the parts of manual pages about options and commands.
 #pragma once
 
 #include <string>

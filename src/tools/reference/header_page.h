@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What libveltra(3) says about the functions, from the comments of their header.
+// Generates the function reference of libveltra(3) from the comments of its header.
 #pragma once
 
 #include <string>

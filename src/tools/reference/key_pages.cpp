@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the manual pages say about keys, client types and reasons.
+// Generates the parts of manual pages about keys, client types and reasons.
 #include "tools/reference/key_pages.h"
 
 #include <fmt/format.h>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the manual pages say about keys, client types and reasons.
+// Generates the parts of manual pages about keys, client types and reasons.
 #pragma once
 
 #include <string>
@@ -15,7 +15,7 @@ std::string preferences();
 std::string clientTypes();
 // A table of the environments: number and section.
 std::string environments();
-// What lint of veltra-storebag finds: name, severity, meaning, mend.
+// The findings of lint: name, severity, meaning, correction.
 std::string findings();
 // The texts that veltractl stats shows, with their names.
 std::string reasons();

@@ -11,7 +11,7 @@
 
 namespace veltrad::reference {
 
-// A file whose whole content is made.
+// A file that is generated completely.
 struct MadeFile {
   const char* path;
   std::string (*make)();

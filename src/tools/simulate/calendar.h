@@ -44,12 +44,12 @@ struct Event {
 
 class Calendar {
  public:
-  // What is later than `end` never happens.
+  // Events after `end` are dropped.
   explicit Calendar(Tick end) : _lists(end) {}
 
   Tick now() const { return _now; }
   double seconds() const { return secondsOf(_now); }
-  // What is planned for the past happens now.
+  // Adds an event; an event in the past happens now.
   void add(Tick at, Event event) {
     at = std::max(at, _now);
     if (at < _lists.size()) _lists[at].push_back(event);

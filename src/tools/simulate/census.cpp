@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Writes samples down and out.
+// Takes samples and writes the report.
 #include "census.h"
 
 #include <utility>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How the devices stand, counted as it changes and written down once a minute.
+// Counts the states of the devices, sampled once a minute.
 #pragma once
 
 #include <array>

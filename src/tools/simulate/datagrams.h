@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How devices send datagrams to dashboards, and send them again.
+// Models how devices send and repeat datagrams to dashboards.
 #pragma once
 
 #include <cstdint>
@@ -11,7 +11,7 @@ namespace veltrad::simulate {
 
 class Datagrams {
  public:
-  // It outlives this.
+  // It must outlive this.
   explicit Datagrams(World& world) : _world(world) {}
 
   void send(std::uint32_t device);

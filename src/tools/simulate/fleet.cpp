@@ -122,14 +122,14 @@ void Fleet::planNext(std::uint32_t index, Kind kind, double perHour) {
   _world.calendar.addIn(_world.dice.exponential(kHour / perHour), _world.eventFor(index, kind));
 }
 
-// The open session goes on with a new storebag: its back ends are made anew, and take over its factor.
+// The open session goes on with a new storebag: its back ends are made again, and take over its factor.
 void Fleet::follow(std::uint32_t index) {
   if (!_world.scenario.settings.storebags.follow || _world.devices[index].standing == Standing::none) return;
   _sampling.nextFactor(index);
   newStorebag(index);
 }
 
-// The state of the open session is computed anew.
+// The state of the open session is computed again.
 void Fleet::newStorebag(std::uint32_t index) {
   Device& device = _world.devices[index];
   const bool reports = _sampling.reports(device, device.factor);
@@ -198,7 +198,7 @@ void Fleet::incident(const Incident& incident, bool begins) {
   }
 }
 
-// Of the first devices, which are a region.
+// Cuts the power of the first devices, which form a region.
 void Fleet::cutPower(const Incident& incident) {
   const auto region = static_cast<std::uint32_t>(incident.share * _world.scenario.devices);
   for (std::uint32_t index = 0; index < region; ++index) {

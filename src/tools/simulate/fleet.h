@@ -14,7 +14,7 @@ namespace veltrad::simulate {
 
 class Fleet {
  public:
-  // It outlives this.
+  // It must outlive this.
   explicit Fleet(const Scenario& scenario);
 
   // Once.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How devices post events, keep the posts that fail, and try them again.
+// Models how devices post events, keep failed posts, and send them again.
 #pragma once
 
 #include <cstdint>
@@ -12,7 +12,7 @@ namespace veltrad::simulate {
 
 class Posts {
  public:
-  // It outlives this.
+  // It must outlive this.
   explicit Posts(World& world);
 
   // The collector answers otherwise from now on.
@@ -25,7 +25,7 @@ class Posts {
   void started(std::uint32_t device);
 
  private:
-  // What an answer of the collector means; made by the daemon's code.
+  // The meaning of a collector's answer, decided by the daemon's code.
   struct Answer {
     bool kept = false;      // with a spool
     bool silences = false;  // without one

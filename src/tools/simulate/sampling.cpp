@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks the daemon's UnseededSequence, stableSamplingFactor, decideOnClient and EventBatch.
+// Uses the daemon's UnseededSequence, stableSamplingFactor, decideOnClient and EventBatch.
 #include "sampling.h"
 
 #include <string>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which sessions report: the sampling factors of a device, and the decision of the daemon about each.
+// Decides which sessions report, with the sampling factors of a device and the daemon's own decision.
 #pragma once
 
 #include <cstdint>
@@ -11,7 +11,7 @@ namespace veltrad::simulate {
 
 class Sampling {
  public:
-  // It outlives this.
+  // It must outlive this.
   explicit Sampling(World& world);
 
   // The factor of the next session's back end that posts events. Its back end for dashboards draws before it.

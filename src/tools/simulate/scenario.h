@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What is simulated: the devices, their settings and storebag, the servers, and what happens to them.
+// The input of a simulation: the devices, their settings and storebag, the servers, and incidents.
 #pragma once
 
 #include <chrono>

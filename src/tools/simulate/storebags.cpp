@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// When to fetch is decided by the daemon's StorebagAge; how the server answers is modelled here.
+// The daemon's StorebagAge decides when to fetch; the server's answers are modelled here.
 #include "storebags.h"
 
 #include <algorithm>

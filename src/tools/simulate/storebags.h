@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// How devices fetch their storebag: for sessions that begin, and for the open one that follows it.
+// Models how devices fetch their storebag: for new sessions, and for the open session that follows it.
 #pragma once
 
 #include <cstdint>
@@ -10,7 +10,7 @@ namespace veltrad::simulate {
 
 class Storebags {
  public:
-  // It outlives this.
+  // It must outlive this.
   explicit Storebags(World& world);
 
   // All have the storebag, and have fetched it at some time within the last cycle.

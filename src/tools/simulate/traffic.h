@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What comes to the servers: requests and datagrams of each second, and the connections that are open.
+// Counts the load of the servers: requests and datagrams of each second, and open connections.
 #pragma once
 
 #include <array>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The state of a simulation: the devices, what the servers answer just now, and what is counted.
+// The state of a simulation: the devices, the servers, and the counts.
 #pragma once
 
 #include <cstdint>
@@ -17,7 +17,7 @@
 
 namespace veltrad::simulate {
 
-// What a device's spool holds for the collector.
+// The posts in a device's spool.
 struct KeptPosts {
   explicit KeptPosts(const backends::SpoolPace& pace) : wait(pace) {}
 
@@ -32,7 +32,7 @@ struct KeptDatagrams {
   Tick made = 0;  // their ticks count from here
 };
 
-// How the session stands that a device opens at its start and keeps.
+// The state of the session that a device opens at its start and keeps.
 enum class Standing : std::uint8_t {
   none,  // it got no storebag, and gets none later
   quiet,
@@ -59,7 +59,7 @@ struct Device {
   bool on = true;
 };
 
-// What the servers do just now.
+// The current behaviour of the servers.
 struct Conditions {
   bool storebagsUp = true;
   bool dashboardsUp = true;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Takes addresses apart.
+// Parses and checks addresses.
 #include "storebag/address_check.h"
 
 #include <arpa/inet.h>
@@ -35,7 +35,7 @@ AddressFault noHTTPS(const std::string& address) {
           fmt::format("Write \"https://{}\".", rest)};
 }
 
-// Of the part after the host: ":8443".
+// Checks the part after the host: ":8443".
 bool isPort(std::string_view text) {
   if (text.empty()) return true;
   unsigned port = 0;

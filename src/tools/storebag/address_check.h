@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whether events can be sent to an address.
+// Checks addresses to which events or datagrams are sent.
 #pragma once
 
 #include <optional>
@@ -16,9 +16,9 @@ struct AddressFault {
   std::string mend;
 };
 
-// What is wrong with the address of a post; nothing: it is good.
+// The fault of a post's address; absent if it is good.
 std::optional<AddressFault> faultOfAddress(const std::string& address);
-// Of a dashboard's address, IPv4 in decimal.
+// The fault of a dashboard's address, which must be IPv4 in decimal.
 std::optional<AddressFault> faultOfIPv4(const std::string& address);
 
 }  // namespace veltrad::storebag

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// A change from one state of a storebag to the next, and what it means to the users of devices.
+// A change between two states of a storebag, and its effect on users.
 #pragma once
 
 #include <cstddef>
@@ -35,7 +35,7 @@ const char* nameOf(ChangeKind kind);
 enum class Effect { more, less, other };
 const char* nameOf(Effect effect);
 
-// Where in the new storebag; of what is gone, where in the old one.
+// The place in the new storebag; for removed parts, in the old one.
 struct ChangePlace {
   std::optional<std::string> section;
   std::optional<std::string> backend;
@@ -60,14 +60,14 @@ struct Change {
 // As it is written; nothing: it is not there.
 std::optional<Value> valueIn(const Dictionary* dictionary, const std::string& key);
 
-// What "more", "less" and "other" are together.
+// The combined effect of changes.
 Effect worstOf(const std::vector<Change>& changes);
 void sortWorstFirst(std::vector<Change>& changes);
 
 // Takes the changes of one place.
 class ChangeSink {
  public:
-  // `changes` outlives it.
+  // `changes` must outlive it.
   ChangeSink(std::vector<Change>& changes, ChangePlace at) : _changes(changes), _at(std::move(at)) {}
 
   void say(ChangeKind kind, Effect effect, std::optional<std::string> key, std::optional<Value> before,

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Whom a client entry is for.
+// The clients that a client entry matches.
 #pragma once
 
 #include <set>
@@ -20,7 +20,8 @@ struct Clientele {
       : clients(lowered(entry.client)), services(lowered(entry.service)) {}
 
   bool operator==(const Clientele&) const = default;
-  // Whether the entry fits every client of this name with a service whose name holds this text; null: any.
+  // Whether the entry matches every client of this name with a service that contains this text; null means
+  // any.
   bool fits(const std::string* client, const std::string* service) const;
 
   // An empty list is everyone.

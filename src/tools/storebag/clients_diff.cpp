@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Pairs entries by their lists, and asks of every name in them which entry it gets before and now.
+// Pairs entries by their lists, and compares for every name in them the old and the new matching entry.
 #include "storebag/clients_diff.h"
 
 #include <fmt/format.h>
@@ -29,7 +29,7 @@ constexpr std::size_t kMostShown = 4;
 // Only texts that have changed places make such pairs.
 constexpr std::size_t kMostPairs = 1000;
 
-// As the daemon reads them: what is no dictionary is passed over.
+// As the daemon reads them: elements that are no dictionaries are skipped.
 std::vector<WrittenEntry> entriesIn(const Array& clients) {
   std::vector<WrittenEntry> entries;
   for (const Value& item : clients)
@@ -50,7 +50,7 @@ Number firstOf(const Number& a, const Number& b) {
   return a && b ? std::min(a, b) : a ? a : b;
 }
 
-// What holds for sessions that require no user info.
+// The addresses for sessions that require no user info.
 struct Addresses {
   // The entry that was taken.
   Number number;
@@ -179,7 +179,7 @@ class ClientsDiff {
     return worstOf(changes);
   }
 
-  // Takes down who gets another entry than before.
+  // Records the clients that get another entry than before.
   void follow(const std::string& who, const Move& move, Effect effect) {
     const auto& [before, now] = move;
     const auto note = [&](Moved& moved, const Number& other) {
@@ -235,7 +235,8 @@ class ClientsDiff {
     }
   }
 
-  // Of these one entry says where their events go and whether they bear the device's identifier.
+  // For these sessions, one entry decides where their events go and whether they contain the device's
+  // identifier.
   void followSessionsWithoutUserInfo() {
     const Addresses before = addressesIn(_old), now = addressesIn(_now);
     if (before.post == now.post && before.realtime == now.realtime && before.extras == now.extras) return;

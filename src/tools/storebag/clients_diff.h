@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Compares two lists of client entries: which belong together, and who gets another one.
+// Compares two lists of client entries: which entries correspond, and which clients get another entry.
 #pragma once
 
 #include <vector>

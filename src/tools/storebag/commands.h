@@ -12,12 +12,12 @@
 namespace veltrad::storebag {
 
 // The text is the output, or says why the command was refused. With `findings` the output shows something
-// that the caller asked to be told about: mistakes, or a file that would change.
+// that the caller asked for: mistakes, or a file that would change.
 struct Outcome {
   bool done = false;
   std::string text;
   bool findings = false;
-  // What failed beside the output, one line each.
+  // Further errors, one line each.
   std::vector<std::string> failures = {};
 };
 
@@ -37,7 +37,7 @@ struct SignRequest {
   std::string privateKey, in, out;
   // Signs what lint calls an error, too.
   bool force = false;
-  // What is written into the storebag before it is signed.
+  // Claims that are written into the storebag before it is signed.
   std::optional<std::int64_t> serial = {};
   std::optional<std::string> expires = {}, name = {};
   // Ed25519 private keys that sign as well.
@@ -78,27 +78,27 @@ Outcome format(const FormatRequest& request);
 // Prints the JSON Schema of storebags.
 Outcome schema();
 
-// For whom a storebag is played, and the files that say more of it.
-struct PlayedSession {
+// The session of an evaluation, and the files with further input.
+struct SimulatedSession {
   Given given;
   std::optional<std::string> device, policy, messages;
 };
 
 struct ExplainRequest {
   std::string file;
-  PlayedSession session;
+  SimulatedSession session;
   std::vector<std::string> payload;
   std::optional<std::string> payloadFile;
   std::optional<std::uint16_t> category, type;
   std::int32_t flag = 0;
   bool json = false;
 };
-// Says what each back end does with the messages of such a session.
+// Describes what each back end does with the messages of such a session.
 Outcome explain(const ExplainRequest& request);
 
 struct DiffRequest {
   std::string before, now;
-  PlayedSession session;
+  SimulatedSession session;
   bool json = false;
 };
 // Says what changes between two states of a storebag; `findings`: more leaves devices than before.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Says changes as JSON and to people.
+// Writes changes as JSON and as readable text.
 #include <fmt/format.h>
 
 #include "base/null_value.h"

@@ -54,7 +54,7 @@ struct StorebagDocument {
 Result<StorebagDocument, DocumentFailure> readStorebag(const std::string& file);
 Result<StorebagDocument, DocumentFailure> storebagOf(const std::string& file, std::string bytes);
 
-// What the daemon takes of a storebag: "at most … bytes, … levels and … values".
+// The daemon's bounds for a storebag: "at most … bytes, … levels and … values".
 std::string boundsOfStorebags();
 
 }  // namespace veltrad::storebag

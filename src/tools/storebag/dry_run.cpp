@@ -26,7 +26,7 @@ Dictionary sessionInfoOf(const Given& given) {
 }  // namespace
 
 DryRun::DryRun(const Given& given, const std::string& name, const backends::SharedProfile& profile)
-    : _given(given), _world(given, name), _word(_world.gate.word()), _sentUserInfo(given.userInfo) {
+    : _given(given), _world(given, name), _decision(_world.gate.decision()), _sentUserInfo(given.userInfo) {
   if (_sentUserInfo) applyPolicy(*_sentUserInfo, _userInfoEdits);
   char deviceID[41] = {};
   _world.device.copyUniqueDeviceID(deviceID, sizeof deviceID);
@@ -39,16 +39,16 @@ DryRun::DryRun(const Given& given, const std::string& name, const backends::Shar
   section.backends.emplace(name, profile);
   const Dictionary sessionInfo = sessionInfoOf(given);
   const auto set = session::createBackends({_world.factory, _world.device, _world.library, _world.clock,
-                                            _world.counters, *_word, nullptr, false, &_notMade},
+                                            _world.counters, *_decision, nullptr, false, &_notMade},
                                            &section, &sessionInfo, std::move(facts));
   if (!set || set->empty()) return;
   _backend = set->begin()->second;
   _backend->updateState();
-  session::forbidByWord(*set, *_word);
+  session::applyProhibitions(*set, *_decision);
 }
 
 void DryRun::applyPolicy(Dictionary& content, config::EditedFields& edits) const {
-  if (_word->fields) _word->fields->apply(content, edits);
+  if (_decision->fields) _decision->fields->apply(content, edits);
 }
 
 void DryRun::play() {

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Plays a start message, the given messages and a flush with one back end of a session.
+// Runs a start message, the given messages and a flush through one back end of a session.
 #pragma once
 
 #include <map>
@@ -17,7 +17,7 @@ namespace veltrad::storebag {
 
 class DryRun {
  public:
-  // `given` outlives it.
+  // `given` must outlive it.
   DryRun(const Given& given, const std::string& name, const backends::SharedProfile& profile);
 
   // Null: the back end is not made, for reasonAgainst().
@@ -28,7 +28,7 @@ class DryRun {
   // By number of the message; 0 is the start message.
   const std::map<std::size_t, Dictionary>& events() const { return _events; }
   const MessageFate& fateOf(std::size_t message) const { return _fates[message]; }
-  // What the owner's policy has left of a message's payload, and what it has changed in it.
+  // The payload of a message after the owner's policy was applied, and the changes.
   const Dictionary& payloadOf(std::size_t message) const { return _payloads[message]; }
   const config::EditedFields& editsOf(std::size_t message) const { return _edits[message]; }
   const std::optional<Dictionary>& sentUserInfo() const { return _sentUserInfo; }
@@ -43,7 +43,7 @@ class DryRun {
 
   const Given& _given;
   DryWorld _world;
-  const std::shared_ptr<const config::OwnersWord> _word;
+  const std::shared_ptr<const config::OwnerDecision> _decision;
   std::optional<Dictionary> _sentUserInfo;
   config::EditedFields _userInfoEdits;
   session::NotMade _notMade;
@@ -52,7 +52,7 @@ class DryRun {
   std::vector<MessageFate> _fates;
   std::vector<Dictionary> _payloads;
   std::vector<config::EditedFields> _edits;
-  // Those that wait in the batch, in order.
+  // The numbers of the messages in the batch, in order.
   std::vector<std::size_t> _batch;
   std::map<std::size_t, Dictionary> _events;
 };

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Everything that back ends use, in memory, so that the daemon's own code can be played: nothing is read from
-// the machine, and nothing leaves it.
+// The services of back ends in memory, so that tools can run the daemon's own code: nothing is read from the
+// machine, and nothing leaves it.
 #pragma once
 
 #include <map>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Finds entries and filters that others make useless, and what an entry lets out.
+// Finds entries and filters that never take effect, and fields that an entry exposes.
 #include "storebag/entry_check.h"
 
 #include <fmt/format.h>
@@ -26,7 +26,7 @@ using config::filterTag;
 using enum FindingName;
 
 constexpr const char* kKeepAction = "keep";
-// Of the methods and statuses of events.
+// The largest method and status of an event.
 constexpr std::int32_t kMostCode = 65'535;
 
 // An entry's clientele, and its number.
@@ -42,13 +42,13 @@ std::vector<const std::string*> eachOf(const Names& names) {
   return all;
 }
 
-// It has a finding of its own, and whom it is for is not known.
+// Such an entry has a separate finding, and the clients that it matches are unknown.
 bool hasWrongNames(const Dictionary& entry) {
   return (entry.contains("client") && !entry.string("client")) ||
          (entry.contains("service") && !entry.string("service"));
 }
 
-// The entries above that together fit everyone whom `entry` fits; empty if someone is left.
+// The earlier entries that together match all clients of `entry`; empty if it matches further clients.
 std::set<std::size_t> shadowsOf(const Clientele& entry, const std::vector<Numbered>& above) {
   std::set<std::size_t> shadows;
   for (const std::string* client : eachOf(entry.clients)) {
@@ -101,7 +101,7 @@ bool isKnownAction(const std::string& action) {
                                               [&](const auto& row) { return action == row.first; });
 }
 
-// One that can be compared with others.
+// A filter that can be compared with others.
 struct Filter {
   std::size_t number;
   std::string key;  // in lower case

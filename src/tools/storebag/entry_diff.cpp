@@ -245,7 +245,8 @@ class EntryDiff {
            overriddenShare(_now, thresholds.second) < held;
   }
 
-  // Of the countries that have one before or now, and are listed before and now: old and new threshold.
+  // The old and new thresholds of countries that are listed before and now and have a threshold of their own
+  // before or now.
   std::map<std::string, Thresholds> countryThresholds() const {
     std::set<std::string> countries = countriesWithThreshold(_old);
     countries.merge(countriesWithThreshold(_now));
@@ -258,7 +259,7 @@ class EntryDiff {
     return all;
   }
 
-  // Those of single countries, where they do not follow from the others.
+  // Compares the thresholds of single countries, unless they follow from the others.
   void compareCountryThresholds() {
     for (const auto& [one, thresholds] : countryThresholds()) {
       const auto changed = changedShares(thresholds.first, thresholds.second);

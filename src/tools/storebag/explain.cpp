@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Tells of each back end what a dry run shows.
+// Explains each back end by a dry run.
 #include <algorithm>
 
 #include "backends/dashboard/packet_text.h"
@@ -30,7 +30,8 @@ bool isContainer(const Value& value) {
   return value.asArray() || value.asDictionary() || value.asData();
 }
 
-// The same with texts in place of what JSON events cannot carry, so that filters show what they do to it.
+// The same, with texts in place of values that JSON events cannot contain, so that the effect of filters on
+// them is visible.
 Given flattened(Given given) {
   const auto flatten = [](Dictionary& dictionary) {
     for (const auto& [key, value] : Dictionary(dictionary))
@@ -60,8 +61,8 @@ double chanceOf(const BackendExplanation& told) {
   }
 }
 
-// What filters did: `plain` is the same message without them. What JSON events cannot carry they may hash,
-// and it does not leave.
+// The changes that filters made: `plain` is the same message without filters. They may hash values that JSON
+// events cannot contain, which do not leave.
 config::EditedFields editsOfFilters(const Dictionary& filtered, const Dictionary& plain,
                                     const Dictionary& leaving) {
   config::EditedFields edits;
@@ -90,14 +91,14 @@ void addLaterEdits(const config::EditedFields& edits, LeavingEvent& told) {
   addEdits(edits, told);
 }
 
-// A field that the user info has lost leaves the message's own in its place.
+// If a field of the user info is removed, the message's field of the same name remains.
 config::EditedFields editsOfUserInfo(const DryRun& run, std::size_t message) {
   config::EditedFields edits = run.userInfoEdits();
   for (const std::string& name : run.editsOf(message).hashed) edits.removed.erase(name);
   return edits;
 }
 
-// Takes out of an event what another run would have different.
+// Removes values from an event that differ in every run.
 void hideFactsOfARun(const DryRun& run, const Dictionary& plain, std::size_t message, Dictionary& event) {
   for (const char* key : kFactsOfARun)
     if (event.contains(key)) event.set(key, nullValue());
@@ -166,7 +167,7 @@ BackendExplanation explainBackend(const Given& given, const std::string& name, c
   if (upload) told.url = upload->postURL;
   told.chance = chanceOf(told);
   if (name == wire::kVeltraBackendMivo) {
-    // Whether there is an adaptor is not the storebag's matter.
+    // The storebag does not decide whether there is an adaptor.
     const bool delivers = told.state == backends::kBackendReporting;
     told.fates.assign(given.messages.size(), {delivers ? wire::Fate::delivered : wire::Fate::dropped, {}});
     return told;
@@ -187,17 +188,17 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
   const std::size_t count = given.messages.size();
   told.fates.assign(count, {wire::Fate::dropped, std::nullopt});
   DryWorld world(given, name);
-  const auto word = world.gate.word();
+  const auto decision = world.gate.decision();
   const bool hasServer = profile && profile->ip && profile->port;
   told.reason = Reason::bad_address;
-  if (!word->policy->makes(name))
+  if (!decision->policy->makes(name))
     told.reason = Reason::policy_backends;
-  else if (hasServer && word->refusalFor(name, {*profile->ip}) == Reason::policy_hosts)
+  else if (hasServer && decision->refusalFor(name, {*profile->ip}) == Reason::policy_hosts)
     told.reason = Reason::policy_hosts;
   if (told.reason != Reason::bad_address || !hasServer ||
       !backends::parseIPv4Address(*profile->ip, *profile->port))
     return told;
-  const auto refusal = word->refusalFor(name, {*profile->ip});
+  const auto refusal = decision->refusalFor(name, {*profile->ip});
   told.state = refusal ? backends::kBackendDisabled : backends::kBackendReporting;
   told.reason = refusal.value_or(Reason::always);
   told.chance = chanceOf(told);
@@ -207,12 +208,12 @@ BackendExplanation explainDashboard(const Given& given, const std::string& name,
   for (const GivenMessage& message : given.messages) {
     Dictionary payload = message.payload.value_or(Dictionary());
     config::EditedFields edits;
-    if (word->fields) word->fields->apply(payload, edits);
+    if (decision->fields) decision->fields->apply(payload, edits);
     addEdits(edits, told);
     char field[backends::PacketText::kSize];
     backends::PacketText(field).append(payload);
     told.texts.emplace_back(field);
-    // Only the device knows its digests. They have decided where the field stands.
+    // Only the device knows its digests, which have determined the place of the field.
     for (const std::string& key : edits.hashed) {
       const std::string* digest = payload.string(key);
       const std::size_t at = digest ? told.texts.back().find(*digest) : std::string::npos;

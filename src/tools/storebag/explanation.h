@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What a storebag does for a session, as the daemon's own code decides it.
+// The effect of a storebag on a session, as the daemon's own code decides it.
 #pragma once
 
 #include <cstdint>
@@ -20,7 +20,7 @@ struct MessageFate {
   std::optional<std::string> url;
 };
 
-// An event that leaves. NaN stands for what only a run knows.
+// An event that leaves. Values that only a run determines are NaN.
 struct LeavingEvent {
   Dictionary fields;
   // Its message, from 1; 0 is the start message.
@@ -46,9 +46,9 @@ struct BackendExplanation {
   std::vector<LeavingEvent> events;
   // One a message.
   std::vector<MessageFate> fates;
-  // Of all events and datagrams.
+  // The names of removed and hashed fields of all events and datagrams.
   std::set<std::string> removed, hashed;
-  // Of the datagrams, one a message.
+  // The texts of the datagrams, one for each message.
   std::vector<std::string> texts;
 };
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Asks both filter tables about one event of each kind that they tell apart.
+// Evaluates both filter tables for one event of each kind that they distinguish.
 #include "storebag/filter_diff.h"
 
 #include <fmt/format.h>
@@ -15,7 +15,7 @@ namespace {
 using config::FilterAction;
 using config::Filters;
 
-// Methods or statuses: those that the filters name, and one that stands for all others.
+// Methods or statuses: those that the filters name, and one for all others.
 struct Codes {
   std::set<std::int32_t> named;
   std::int32_t other = 0;

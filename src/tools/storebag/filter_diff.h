@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Compares what the filters of two entries do to each field.
+// Compares the effect of two entries' filters on each field.
 #pragma once
 
 #include <optional>
@@ -12,7 +12,7 @@
 
 namespace veltrad::storebag {
 
-// What changes for a field, in the events in which it changes for the worst.
+// The change for a field, in the events with the worst change.
 struct FieldChange {
   // As it is written.
   std::string name;

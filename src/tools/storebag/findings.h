@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What lint finds, and how it is said.
+// The findings of lint, and their text.
 #pragma once
 
 #include <span>
@@ -28,7 +28,7 @@ struct FindingKind {
   const char* meaning;
   const char* mend;
 };
-// All, in the order of their names above.
+// All kinds of findings, in the order of their names above.
 std::span<const FindingKind> findingKinds();
 const FindingKind& kindOf(FindingName name);
 // Null if there is no such name.

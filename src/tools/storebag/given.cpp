@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads what a storebag is played with.
+// Reads the input of an evaluation.
 #include "storebag/given.h"
 
 #include <fmt/format.h>

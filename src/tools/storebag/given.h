@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// For whom a storebag is played: a session, its device and user, and its messages.
+// The input of an evaluation of a storebag: a session, its device and user, and its messages.
 #pragma once
 
 #include <cstdint>
@@ -24,8 +24,8 @@ struct GivenMessage {
   std::optional<Dictionary> payload;
 };
 
-// What is not given is as on a device in the release environment whose user has consented and which is
-// sampled in. Its 14 fields are the options of explain.
+// Missing values are those of a device in the release environment that is sampled in and has consent. Its 14
+// fields are the options of explain.
 struct Given {
   std::int32_t clientType = 0;
   std::uint32_t environment = 4;
@@ -41,7 +41,7 @@ struct Given {
   double draw = 0;
   // By back end, instead of `draw`.
   std::map<std::string, double> draws;
-  // What policy.json says; absent: no limits.
+  // The content of policy.json; absent if there are no limits.
   std::optional<Dictionary> policy;
   std::vector<GivenMessage> messages;
 

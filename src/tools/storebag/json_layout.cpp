@@ -29,7 +29,7 @@ using Comments = std::vector<Comment>;
 struct Item;
 
 struct Node {
-  // Of a scalar.
+  // The text of a scalar.
   std::string_view text;
   char open = '\0', close = '\0';  // of a container
   std::vector<Item> items;

@@ -8,8 +8,8 @@
 namespace veltrad::storebag {
 
 // `text` is one that parseJSONWithComments takes. Keys get the order of the tables; unknown ones follow in
-// their own. Comments stay with what they stand above or behind. What the author wrote on one line stays
-// there if it fits into 100 columns. The result of a result is the same.
+// their own. A comment stays with the line below it or, at the end of a line, with that line. Values on one
+// line stay on one line if they fit into 100 columns. Formatting twice gives the same result.
 std::string laidOut(std::string_view text);
 
 }  // namespace veltrad::storebag

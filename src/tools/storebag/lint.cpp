@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Goes through a storebag by the tables that the daemon reads it with.
+// Checks a storebag against the tables with which the daemon reads it.
 #include "storebag/lint.h"
 
 #include <fmt/format.h>
@@ -31,7 +31,7 @@ std::vector<std::string> namesOf(const KeyTable& table, bool sectionsOnly) {
   return names;
 }
 
-// As it stands within a sentence; "UDP port" keeps its capitals.
+// In lower case for use within a sentence; "UDP port" keeps its capitals.
 std::string withinSentence(std::string text) {
   const bool isWord = text.size() > 1 && std::islower(static_cast<unsigned char>(text[1])) != 0;
   return isWord ? lowerCase(text.substr(0, 1)) + text.substr(1) : text;
@@ -61,7 +61,7 @@ class Lint {
 
   void checkDictionary(const Spot& at, const Dictionary& dictionary, const KeyTable& table) {
     sayDuplicates(at);
-    // Keys that stand there under another name, or without a value.
+    // Keys that are present under another name, or without a value.
     std::set<std::string> misnamed;
     for (const std::string& name : allNames(at, dictionary)) {
       const Value* value = dictionary.find(name);
@@ -88,7 +88,7 @@ class Lint {
   LintSink& sink() { return _sink; }
 
  private:
-  // Those whose value is null, too.
+  // All keys, also those with a null value.
   static std::set<std::string> allNames(const Spot& at, const Dictionary& dictionary) {
     std::set<std::string> names;
     for (const auto& [name, value] : dictionary) names.insert(name);
@@ -180,7 +180,7 @@ class Lint {
           "Add an entry, or take the back end out.");
   }
 
-  // What no key says alone.
+  // Checks that concern several keys.
   void checkWhole(const Spot& at, const Dictionary& dictionary, const KeyTable& table,
                   const std::set<std::string>& misnamed) {
     if (&table == &config::ClientEntry::kKeys) {
@@ -220,7 +220,7 @@ class Lint {
   LintSink _sink;
 };
 
-// What devices with the settings for it cannot read.
+// Checks the claims that devices with the corresponding settings cannot read.
 void checkClaims(const StorebagDocument& bag, LintSink& sink) {
   static constexpr std::pair<const char*, const char*> kMends[] = {
       {"expires", "Write a date like \"2026-12-31\", or with a time: \"2026-12-31T18:00:00Z\"."},

@@ -19,7 +19,7 @@ struct LintOptions {
 std::vector<Finding> lintStorebag(const StorebagDocument& bag, const LintOptions& options = {});
 // The errors among them, one a line behind a line with their number; empty if there are none.
 std::string errorsIn(const StorebagDocument& bag);
-// Of a file that is no storebag.
+// The finding for a file that is no storebag.
 Finding findingOf(const DocumentFailure& failure);
 
 }  // namespace veltrad::storebag

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Plays the sessions of a recording with two states of a storebag and compares what becomes of each message.
+// Evaluates the sessions of a recording with two states of a storebag and compares the fate of each message.
 #include <fmt/format.h>
 
 #include <algorithm>
@@ -60,7 +60,7 @@ std::string fateOf(const BackendExplanation& told, std::size_t message) {
   return text;
 }
 
-// Of the back ends in which something becomes another.
+// Compares the fates in the back ends that differ.
 ChangedMessage compareFates(const Explanation& before, const Explanation& now, std::size_t message) {
   std::set<std::string> names;
   for (const auto* told : {&before, &now})

@@ -83,7 +83,9 @@ void describeKeys(CLI::App& app, Arguments& given) {
           "Public key whose Ed25519 signature must be there, too, in DER or PEM form");
   verify->add_option("FILE", given.file, "The container")->required();
   verify->callback([&given] { given.outcome = storebag::verify(given.key, given.file, given.ed25519); });
+}
 
+void describeServing(CLI::App& app, Arguments& given) {
   CLI::App* publish = addCommand(
       app, "publish", "Put signed storebags where a web server serves them, each under its file's name");
   publish->positionals_at_end();  // the last one is DIR
@@ -153,7 +155,7 @@ CLI::Option* addEach(CLI::App& command, const std::string& name, const std::stri
   return addTaken<std::vector<std::string>>(command, name, help, takeAll)->allow_extra_args(false);
 }
 
-void addSession(CLI::App& command, PlayedSession& played) {
+void addSession(CLI::App& command, SimulatedSession& played) {
   Given& session = played.given;
   command.add_option("--client-type", session.clientType, "Kind of client, which selects the storebag")
       ->type_name("N")
@@ -179,7 +181,7 @@ void addSession(CLI::App& command, PlayedSession& played) {
   command.add_flag("--batch-events", session.batchEvents, "Let back ends collect events");
 }
 
-void addDevice(CLI::App& command, PlayedSession& played) {
+void addDevice(CLI::App& command, SimulatedSession& played) {
   Given& session = played.given;
   addTaken<std::string>(command, "--country", "Country of the locale; without it there is none",
                         [&session](const std::string& code) { return session.takeCountry(code); })
@@ -240,6 +242,7 @@ void describe(CLI::App& app, Arguments& given) {
   app.set_version_flag("--version", std::string("veltra-storebag ") + kVersion, "Print the version");
   app.require_subcommand(1);
   describeKeys(app, given);
+  describeServing(app, given);
   describeWriting(app, given);
   describePlaying(app, given);
   app.footer(kFooter);  // last, because commands inherit it

@@ -11,6 +11,7 @@
 
 namespace veltrad::storebag {
 
+// What the command line gives. Its 16 fields are the options of all commands and the outcome.
 struct Arguments {
   std::string directory, key, ed25519, file;
   int bits = config::SigningKey::kFewestBits;
@@ -24,7 +25,7 @@ struct Arguments {
   ExplainRequest explain;
   DiffRequest diff;
   TestRequest test;
-  // Of the command, which runs while the arguments are parsed.
+  // The outcome of the command, which runs while the arguments are parsed.
   Outcome outcome;
 };
 

@@ -54,7 +54,7 @@ Result<Publication, std::string> checked(const std::string& file, const PublishR
   return made;
 }
 
-// What no device takes has no serial that one could have seen.
+// A storebag that no device accepts has no serial that a device could have seen.
 std::optional<std::int64_t> serialIn(const std::optional<std::string>& bytes) {
   if (!bytes) return std::nullopt;
   const auto bag = storebagOf({}, *bytes);

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Puts storebags into the folder that is served, and goes back to those that were served before.
+// Publishes storebags into the served folder, and rolls back to earlier ones.
 #pragma once
 
 #include <cstdint>
@@ -19,19 +19,19 @@ struct PublishRequest {
   // As for verify().
   std::string ed25519 = {};
 };
-// Publishes all or, if lint, a key, a name, a date or a serial says no to one of them, none. Each file is
-// replaced as a whole, and is newer than the one before by its time of modification, by which daemons ask.
-// What is served already stays as it is.
+// Publishes all, or none if one of them fails the check of lint, key, name, date or serial. Each file is
+// replaced as a whole, and is newer than the one before by its time of modification, by which daemons ask. A
+// storebag that is served already is not changed.
 Outcome publish(const PublishRequest& request);
 
 struct RollbackRequest {
   std::vector<std::string> names;
   std::string directory;
-  // Also to one that devices can refuse.
+  // Rolls back even to a storebag that devices can refuse.
   bool force = false;
 };
-// Puts the storebags back that were served before; what is served now is not kept. All or, if devices would
-// refuse one of them, none.
+// Serves the previous storebags again; the current ones are not kept. All, or none if devices would refuse
+// one of them.
 Outcome rollback(const RollbackRequest& request);
 
 // Why a storebag with the serial `next` may not replace one with `served`; empty: it may. A device that

@@ -14,7 +14,7 @@ struct RecordedMessage {
   // In the file, from 1.
   std::size_t line = 0;
   GivenMessage message;
-  // What the line says of the session; empty in lines of `veltractl session`.
+  // The session's data in the line; empty in lines of `veltractl session`.
   Dictionary session;
 };
 

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Says in JSON Schema what the tables of keys say.
+// Converts the tables of keys to JSON Schema.
 #include "storebag/schema.h"
 
 #include <fmt/format.h>

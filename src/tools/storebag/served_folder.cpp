@@ -23,7 +23,7 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr unsigned kServedMode = 0644;
-// Of each name.
+// The number of kept storebags for each name.
 constexpr std::size_t kMostKept = 10;
 
 using Bytes = std::optional<std::string>;

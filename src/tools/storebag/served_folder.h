@@ -29,12 +29,12 @@ class ServedFolder {
   std::string pathOf(const std::string& name) const { return _directory + "/" + name; }
   // Absent if nothing is served under the name.
   Result<std::optional<std::string>, std::string> served(const std::string& name) const;
-  // The newest of those kept that is not what is served. Absent if there is none.
+  // The newest kept storebag that differs from the served one; absent if there is none.
   Result<std::optional<Kept>, std::string> before(const std::string& name) const;
 
-  // Keeps what is served, and serves the bytes instead. Does nothing if they are served already.
+  // Keeps the served storebag and replaces it by these bytes. Does nothing if they are served already.
   Result<Done, std::string> put(const std::string& name, const std::string& bytes) const;
-  // Serves what before() has found, and forgets it with those that were kept after it.
+  // Serves the result of before() again, and removes it and all later ones from those kept.
   Result<Done, std::string> putBack(const std::string& name, const Kept& kept) const;
 
  private:

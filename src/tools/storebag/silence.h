@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Keeps the daemon's code quiet while a tool uses it: the lines of its log are not what was asked for.
+// Suppresses the log of the daemon's code while a tool uses it.
 #pragma once
 
 #include <string_view>

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Goes down into dictionaries and arrays.
+// Descends into dictionaries and arrays.
 #include "storebag/spot.h"
 
 #include <fmt/format.h>

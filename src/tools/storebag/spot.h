@@ -13,9 +13,9 @@ namespace veltrad::storebag {
 struct Spot {
   // "release.httppost.clients[0]"; empty at the top.
   std::string path;
-  // Of the key, or of the element's first character; where that is not known, of what it stands in.
+  // The place of the key, or of the element's first character; if unknown, that of the enclosing value.
   TextPlace place;
-  // What is in the value. Null if it is not known.
+  // The places inside the value; null if unknown.
   const formats::Places* inside = nullptr;
 
   static Spot top(const formats::Places& places) { return {"", places.place, &places}; }

@@ -44,7 +44,7 @@ bool isMade(const std::string& name, const SharedProfile& profile) {
   return name == wire::kVeltraBackendAmpery || name == wire::kVeltraBackendMivo;
 }
 
-// What it is for: "events go to c.example".
+// The purpose of a back end: "events go to c.example".
 std::string purposeOf(const SharedProfile& profile, const std::string& name, const char* verb) {
   if (const auto* https = as<HTTPSPostProfile>(profile)) {
     std::set<std::string> hosts;
@@ -147,7 +147,7 @@ void compareSections(const std::string& name, const Dictionary* before, const Di
   for (const std::string& backend : backends) BackendDiff(name, backend, changes).compare(*old, *current);
 }
 
-// What the whole storebag says of itself.
+// Compares the claims and other keys of the top level.
 void compareTop(const Dictionary& before, const Dictionary& now, std::vector<Change>& changes) {
   ChangeSink sink(changes, {});
   const auto shown = [](const std::optional<Value>& value) {

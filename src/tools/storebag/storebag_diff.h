@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What changes from one state of a storebag to the next.
+// Compares two states of a storebag.
 #pragma once
 
 #include <optional>

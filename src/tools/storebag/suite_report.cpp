@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Says what became of suites: for people, as JSON and for build servers.
+// Writes the results of suites: as readable text, as JSON and for build servers.
 #include <fmt/format.h>
 
 #include <algorithm>

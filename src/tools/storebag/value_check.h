@@ -12,7 +12,7 @@ namespace veltrad::storebag {
 // `at` is the key's. `lab`: as in LintOptions.
 void checkValue(LintSink& sink, bool lab, const Spot& at, const config::Key& key, const Value& value);
 
-// What a value of this type is: "a text".
+// The name of a type with its article: "a text".
 const char* typeText(config::KeyType type);
 // The range that has a meaning: " from 0 to 1"; empty if the key has none.
 std::string rangeText(const config::Key& key);

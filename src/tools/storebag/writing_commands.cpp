@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The commands for whoever writes a storebag: lint, fmt and schema.
+// The commands for writing storebags: lint, fmt and schema.
 #include <fmt/format.h>
 #include <sys/stat.h>
 

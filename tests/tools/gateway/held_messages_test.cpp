@@ -4,6 +4,7 @@
 
 #include <gmock/gmock.h>
 
+#include "fakes/scarce_memory.h"
 #include "gateway/drain.h"
 #include "gateway/refusals.h"
 #include "gateway/stream.h"
@@ -18,20 +19,21 @@ using testing::IsEmpty;
 class Held : public testing::Test {
  protected:
   bool add(const std::string& id, std::size_t bytes = 10) {
-    return held.add(
-        {"events", id, {}, std::string(bytes, 'x')},
-        [this, id](Outcome outcome) { told.emplace_back(id, outcome); }, now);
+    HeldMessages::Completion completion = [this, id](Outcome outcome) { told.emplace_back(id, outcome); };
+    return held.add({"events", id, {}, std::string(bytes, 'x')}, completion, now);
   }
   std::vector<std::string> due() {
     std::vector<std::string> ids;
-    for (const auto& one : held.due(now)) ids.push_back(one.message->id);
+    while (const auto one = held.due(now)) ids.push_back(one->message->id);
     return ids;
   }
-  void tell(const std::vector<HeldMessages::Completion>& completions, Outcome outcome) {
-    for (const auto& completion : completions) completion(outcome);
+  void tell(const std::vector<HeldMessages::Waiter>& waiters, Outcome outcome) {
+    for (const auto& waiter : waiters) waiter.completion(outcome);
   }
 
   HeldMessages::Time now{1h};
+  // Of the second message that is added.
+  std::uint64_t token = 2;
   HeldMessages held{{.bytes = 2'000, .messages = 3, .hold = 15s, .again = 1s, .afterRefusal = 250ms}};
   std::vector<std::pair<std::string, Outcome>> told;
 };
@@ -80,6 +82,27 @@ TEST_F(Held, AreBoundedByNumberAndBytes) {
   tell(held.taken(2), Outcome::taken);
   EXPECT_FALSE(add("e", 1'300)) << "more bytes than are left";
   EXPECT_TRUE(add("f", 900));
+}
+
+TEST_F(Held, AreAddedAsAWholeOrNotAtAll) {
+  ASSERT_TRUE(add("a"));
+  forEachShortage([this](const auto& whenShort) {
+    for (const char* id : {"a", "b"}) {  // one that joins, one that is new
+      Message message{"events", id, {}, "x"};
+      bool called = false, added = false;
+      HeldMessages::Completion completion = [&called](Outcome) { called = true; };
+      const std::size_t before = held.bytes();
+      whenShort([&] { added = held.add(std::move(message), completion, now); });
+      EXPECT_EQ(static_cast<bool>(completion), !added);
+      const bool isNew = added && *id == 'b';
+      EXPECT_EQ(held.messages(), isNew ? 2u : 1u);
+      EXPECT_EQ(held.bytes() > before, isNew);
+      if (!isNew) continue;
+      tell(held.taken(std::exchange(token, token + 1)), Outcome::taken);
+      EXPECT_TRUE(called);
+      EXPECT_THAT(due(), testing::Not(testing::Contains("b")));
+    }
+  });
 }
 
 TEST_F(Held, EndWhenTheProcessEnds) {

@@ -10,6 +10,7 @@
 
 #include "base/file_descriptor.h"
 #include "base/thread.h"
+#include "fakes/scarce_memory.h"
 #include "gateway/body_pace.h"
 
 namespace veltrad::gateway {
@@ -20,8 +21,8 @@ using testing::HasSubstr;
 using testing::StartsWith;
 
 // Answers with the number of its turns and of those that other bodies had meanwhile.
-struct CountingTaker final : BodyTaker {
-  CountingTaker(std::shared_future<void> begin, int& all) : begins(std::move(begin)), turnsOfAll(all) {}
+struct CountingHandler final : BodyHandler {
+  CountingHandler(std::shared_future<void> begin, int& all) : begins(std::move(begin)), turnsOfAll(all) {}
 
   std::optional<Answer> take(std::string_view& bytes) override {
     begins.wait();
@@ -31,8 +32,9 @@ struct CountingTaker final : BodyTaker {
     return std::nullopt;
   }
   bool hasRoom(std::function<void()>) override { return true; }
-  void finish(std::function<void(Answer)> answer) override {
-    answer({200, std::to_string(turns) + " " + std::to_string(turnsOfAll - turns), "", {}});
+  void finish(std::function<void()> done) override { done(); }
+  Answer answer() override {
+    return {200, std::to_string(turns) + " " + std::to_string(turnsOfAll - turns), "", {}};
   }
 
   const std::shared_future<void> begins;
@@ -43,8 +45,8 @@ struct CountingTaker final : BodyTaker {
 class Server : public testing::Test {
  protected:
   Server()
-      : server([this](const RequestHead&) { return std::make_unique<CountingTaker>(begins, turns); },
-               {.stalled = 1s}) {
+      : server([this](const RequestHead& head) { return handle(head); }, {.stalled = 1s},
+               [this] { ++shortages; }) {
     const std::string address = server.listen("127.0.0.1:0").value();
     port = static_cast<std::uint16_t>(std::stoi(address.substr(address.rfind(':') + 1)));
     EXPECT_TRUE(thread.start("http", 1u << 20, [this] { server.run(); }));
@@ -52,6 +54,14 @@ class Server : public testing::Test {
   ~Server() override {
     server.end();
     thread.join();
+  }
+
+  std::variant<Answer, std::unique_ptr<BodyHandler>> handle(const RequestHead& head) {
+    if (head.method() == "POST") return std::make_unique<CountingHandler>(begins, turns);
+    if (scarce) failed = scarce->hasFailed();
+    scarce.reset();
+    if (head.method() == "GET") scarce.emplace(granted, true);
+    return Answer{200, "made", "text/plain", {{"X-VLT-Long", std::string(100, 'x')}}};
   }
 
   FileDescriptor connected(std::string_view request) const {
@@ -84,6 +94,11 @@ class Server : public testing::Test {
   std::promise<void> begin;
   const std::shared_future<void> begins = begin.get_future();
   int turns = 0;
+  // Of the server's thread, between a GET and a PUT.
+  std::optional<ScarceMemory> scarce;
+  std::atomic<std::size_t> granted{0};
+  std::atomic<bool> failed{false};
+  std::atomic<int> shortages{0};
   HTTPServer server;
   std::uint16_t port = 0;
   Thread thread;
@@ -127,6 +142,29 @@ TEST_F(Server, EndsABodyThatDripsForEver) {
   while (send(link, "x") && ::recv(link.get(), &nothing, 1, 0) < 0 && errno == EAGAIN)
     ASSERT_LT(std::chrono::steady_clock::now() - started, 10s);
   EXPECT_GE(std::chrono::steady_clock::now() - started, 900ms);
+}
+
+TEST_F(Server, OutlivesEachWantOfMemory) {
+  begin.set_value();
+  const auto asked = [this](const char* method) {
+    return received(connected(method + std::string(" / HTTP/1.1\r\nHost: h\r\nContent-Length: 25\r\n\r\n") +
+                              std::string(25, 'x')));
+  };
+  int refused = 0;
+  do {
+    failed = false;
+    const int before = shortages;
+    const bool told = !asked("GET").empty();
+    const std::string answer = asked("POST");
+    int tries = 0;
+    while (asked("PUT").empty()) ASSERT_LT(++tries, 3) << granted;
+    if (!told || answer.empty() || answer.find(" 503 ") != std::string::npos)
+      EXPECT_GT(shortages, before) << granted;
+    else
+      EXPECT_THAT(answer, StartsWith("HTTP/1.1 200"));
+    refused += answer.find("X-VLT-Refused: no_memory\r\n") != std::string::npos;
+  } while (++granted, failed);
+  if (granted > 1) EXPECT_GT(refused, 5);
 }
 
 TEST(BodyPace, EndsBodiesThatAreSlowForLong) {

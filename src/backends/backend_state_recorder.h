@@ -1,18 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the record of fates says of how a back end stands. The session's thread.
+// Writes the state of a back end into the record of fates. The session's thread.
 #pragma once
 
 #include <cstdint>
 
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 
 namespace veltrad::backends {
 
-// One entry serves many messages, until the back end stands otherwise, or the entry is so old that it would
-// be overwritten before those that refer to it.
-class StandingRecord {
+// One entry serves many messages, until the back end's state changes, or until the entry is so old that it
+// would be overwritten before the entries that refer to it.
+class BackendStateRecorder {
  public:
-  wire::FateRef of(const platform::FatePen& pen, const wire::StandingEntry& now) {
+  wire::FateRef of(const platform::FateWriter& pen, const wire::StandingEntry& now) {
     if (!pen.writes()) return 0;
     const wire::FateWords words = wire::wordsOf(now);
     if (words != _last || !pen.ring()->fresh(_position)) {

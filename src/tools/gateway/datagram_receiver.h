@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The door for dashboards' datagrams, on a thread of its own. A datagram is acknowledged when the stream has
+// Receives dashboards' datagrams on a thread of its own. A datagram is acknowledged when the stream has
 // taken it.
 #pragma once
 
@@ -20,13 +20,13 @@ namespace veltrad::gateway {
 // The datagram as the stream's message has it: a JSON object, and an ID that is the same whenever it is sent.
 Message messageOfDatagram(std::string_view datagram);
 
-class DatagramDoor {
+class DatagramReceiver {
  public:
   // The publisher and the metrics must outlive it. `most`: what waits for the stream, so that a flood leaves
   // room for posts.
-  DatagramDoor(Publisher& publisher, Metrics& metrics, std::size_t most)
+  DatagramReceiver(Publisher& publisher, Metrics& metrics, std::size_t most)
       : _publisher(publisher), _metrics(metrics), _most(most) {}
-  ~DatagramDoor() { stop(); }
+  ~DatagramReceiver() { stop(); }
 
   // Binds to "ADDRESS:PORT" (IPv4), which other gateways may share, and serves. Returns the address with the
   // port that was given for port 0.
@@ -35,7 +35,7 @@ class DatagramDoor {
   void stop();
 
  private:
-  // Outlives the door where completions still hold it.
+  // Outlives the receiver where completions still hold it.
   struct Socket {
     FileDescriptor descriptor;
     std::atomic<std::size_t> underWay{0};
@@ -49,7 +49,7 @@ class DatagramDoor {
   void run();
   bool receive(char* room, std::size_t size);
   void handle(const Sender& sender, std::string_view datagram);
-  static void acknowledge(const Socket& socket, const Sender& sender, std::string header);
+  static void acknowledge(const Socket& socket, const Sender& sender, const std::string& header);
 
   Publisher& _publisher;
   Metrics& _metrics;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the daemon was last told about a session, and how a new connection is told it again.
+// Remembers the description of a session as last sent, to repeat it on a new connection.
 #pragma once
 
 #include <cstdint>
@@ -10,9 +10,9 @@
 
 namespace veltrad::client {
 
-// What a call changes about its session.
+// The change of the session that a call makes.
 struct SessionChange {
-  // What `described`, arguments of the session's description, replaces.
+  // The part of the description that `described` (the call's arguments) replaces.
   enum class Part {
     nothing,
     // The user info; if there is none, the session loses it, unless it requires some.
@@ -27,7 +27,7 @@ struct SessionChange {
   bool finishes = false;
 };
 
-class SessionStanding {
+class SessionDescription {
  public:
   void apply(const SessionChange& change);
 
@@ -38,7 +38,7 @@ class SessionStanding {
   // No copies follow, also on later connections.
   void endAggregation();
 
-  // The calls that describe and start the session anew, as far as it was described and started. `startID` is
+  // The calls that describe and start the session again, as far as it was described and started. `startID` is
   // the call ID of the second one.
   std::string firstCalls(std::uint32_t startID) const;
 

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Opens the door in a directory of its own.
-#include "testing/stand_in.h"
+// Listens in a directory of its own.
+#include "testing/test_daemon.h"
 
 #include <stdlib.h>
 
@@ -8,13 +8,13 @@
 #include <filesystem>
 #include <system_error>
 
-#include "testing/played_session.h"
+#include "testing/simulated_session.h"
 
 namespace veltrad::testing {
 
 namespace {
 
-// For what has arrived to be run.
+// The time for running the calls that have arrived.
 constexpr std::chrono::seconds kLongestStop{5};
 
 }  // namespace
@@ -39,12 +39,12 @@ TestRoot::~TestRoot() {
   if (!_path.empty()) std::filesystem::remove_all(_path, ignored);
 }
 
-StandIn::StandIn(TestRoot directory)
+TestDaemon::TestDaemon(TestRoot directory)
     : _directory(std::move(directory)),
       _root(_directory.path()),
       _entitlements(_files, _root.entitlementsPath()) {}
 
-std::optional<std::string> StandIn::start() {
+std::optional<std::string> TestDaemon::start() {
   auto socket = ipc::openServiceSocket(_root, std::nullopt);
   if (!socket) return socket.error();
   ipc::ListenerOptions options{std::move(socket.value()), _entitlements, _lentFiles, _counters, _memory,
@@ -56,23 +56,23 @@ std::optional<std::string> StandIn::start() {
   return "There is no thread or descriptor for accepting connections.";
 }
 
-std::optional<std::string> StandIn::restart() {
+std::optional<std::string> TestDaemon::restart() {
   stop();
   return start();
 }
 
-void StandIn::stop() {
+void TestDaemon::stop() {
   if (!_listener) return;
   _listener->invalidate(std::chrono::steady_clock::now() + kLongestStop);
   _listener.reset();
 }
 
-bool StandIn::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
+bool TestDaemon::listener(ipc::Listener&, const std::shared_ptr<ipc::Connection>& connection) {
   if (const auto text = _script.refusal()) {
     connection->refuse(*text);
     return true;
   }
-  connection->setObserver(std::make_shared<PlayedSession>(_script, _answers));
+  connection->setObserver(std::make_shared<SimulatedSession>(_script, _answers));
   connection->resume();
   return true;
 }

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Receives datagrams with the address that they came to, from which they are acknowledged.
-#include "gateway/datagram_door.h"
+#include "gateway/datagram_receiver.h"
 
 #include <arpa/inet.h>
 #include <poll.h>
@@ -14,6 +14,7 @@
 
 #include "config/client_types.h"
 #include "formats/json.h"
+#include "gateway/attempt.h"
 #include "gateway/digest.h"
 #include "platform/log.h"
 #include "tools/dashboard_packet.h"
@@ -90,7 +91,7 @@ Message messageOfDatagram(std::string_view datagram) {
   return {subject::kDatagrams, digestOf("/dashboard", datagram), {}, formats::writeJSON(fields)};
 }
 
-Result<std::string, std::string> DatagramDoor::start(const std::string& text) {
+Result<std::string, std::string> DatagramReceiver::start(const std::string& text) {
   auto address = addressOf(text);
   if (!address) return Failure{text + ": expected ADDRESS:PORT, with an IPv4 address"};
   socklen_t length = sizeof *address;
@@ -111,24 +112,28 @@ Result<std::string, std::string> DatagramDoor::start(const std::string& text) {
   return text.substr(0, text.rfind(':') + 1) + std::to_string(ntohs(address->sin_port));
 }
 
-void DatagramDoor::stop() {
+void DatagramReceiver::stop() {
   if (!_thread.running()) return;
   ::eventfd_write(_stopping.get(), 1);
   _thread.join();
 }
 
-void DatagramDoor::run() {
+void DatagramReceiver::run() {
   // One byte more than a datagram may have tells one that is too long.
   char room[tools::kMostPacketBytes + 1];
   pollfd watched[] = {{_socket->descriptor.get(), POLLIN, 0}, {_stopping.get(), POLLIN, 0}};
   for (;;) {
     ::poll(watched, 2, -1);
     if (watched[1].revents != 0) return;
-    for (int i = 0; i < kDatagramsAtOnce && receive(room, sizeof room); ++i) continue;
+    bool more = true;
+    for (int i = 0; i < kDatagramsAtOnce && more; ++i) {
+      // What there is no memory for is not acknowledged, so it comes again.
+      if (!attempt([&] { more = receive(room, sizeof room); })) _metrics.datagrams.add("no_memory");
+    }
   }
 }
 
-bool DatagramDoor::receive(char* room, std::size_t size) {
+bool DatagramReceiver::receive(char* room, std::size_t size) {
   Sender sender;
   Control control{};
   iovec part{room, size};
@@ -156,26 +161,25 @@ bool DatagramDoor::receive(char* room, std::size_t size) {
   return true;
 }
 
-void DatagramDoor::handle(const Sender& sender, std::string_view datagram) {
+void DatagramReceiver::handle(const Sender& sender, std::string_view datagram) {
   if (const char* fault = faultName(datagram)) return _metrics.datagrams.add(fault);
-  if (_socket->underWay.fetch_add(1) >= _most) {
-    _socket->underWay.fetch_sub(1);
-    return _metrics.datagrams.add("no_room");
-  }
+  if (_socket->underWay >= _most) return _metrics.datagrams.add("no_room");
   std::string answer = tools::asksForAcknowledgement(datagram) ? tools::acknowledgementOf(datagram) : "";
-  _publisher.publish(messageOfDatagram(datagram), [socket = _socket, sender, answer = std::move(answer),
-                                                   &metrics = _metrics](Outcome outcome) {
-    socket->underWay.fetch_sub(1);
-    if (outcome != Outcome::taken)
-      return metrics.datagrams.add(outcome == Outcome::late ? "held_too_long" : "no_room");
-    metrics.datagrams.add(answer.empty() ? "taken" : "acknowledged");
+  Message message = messageOfDatagram(datagram);
+  Publisher::Completion completion = [socket = _socket, sender, answer = std::move(answer),
+                                      &metrics = _metrics](Outcome outcome) {
+    --socket->underWay;
+    if (outcome != Outcome::taken) return metrics.datagrams.add(reasonOf(outcome));
     if (!answer.empty()) acknowledge(*socket, sender, answer);
-  });
+    metrics.datagrams.add(answer.empty() ? "taken" : "acknowledged");
+  };
+  ++_socket->underWay;
+  _publisher.publish(std::move(message), std::move(completion));
 }
 
-void DatagramDoor::acknowledge(const Socket& socket, const Sender& sender, std::string header) {
+void DatagramReceiver::acknowledge(const Socket& socket, const Sender& sender, const std::string& header) {
   Control control{};
-  iovec part{header.data(), header.size()};
+  iovec part{const_cast<char*>(header.data()), header.size()};
   msghdr message{};
   message.msg_name = const_cast<sockaddr_in*>(&sender.from);
   message.msg_namelen = sizeof sender.from;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The commands of veltractl for those who look after a device.
+// The options of veltractl's commands for administrators.
 #include "tools/ctl/command_options.h"
 
 #include <fmt/format.h>

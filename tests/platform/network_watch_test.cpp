@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Which messages of the kernel announce a route.
-#include "platform/wake_watch.h"
+#include "platform/network_watch.h"
 
 #include <gtest/gtest.h>
 #include <linux/rtnetlink.h>
@@ -19,7 +19,7 @@ std::string message(std::uint16_t type, std::uint32_t length = sizeof(nlmsghdr) 
   return bytes + std::string(4, 'x');  // padded
 }
 
-TEST(WakeWatch, KnowsARouteThatComesAndEndsAtBrokenLengths) {
+TEST(NetworkWatch, KnowsARouteThatComesAndEndsAtBrokenLengths) {
   const std::pair<std::string, bool> rows[] = {
       {"", false},
       {message(RTM_NEWROUTE), true},
@@ -30,7 +30,7 @@ TEST(WakeWatch, KnowsARouteThatComesAndEndsAtBrokenLengths) {
       {message(RTM_NEWROUTE).substr(0, sizeof(nlmsghdr) - 1), false}};
   for (const auto& [bytes, tells] : rows)
     EXPECT_EQ(platform::tellsOfRoute(bytes.data(), bytes.size()), tells) << &bytes - &rows[0].first;
-  platform::WakeWatch watch;
+  platform::NetworkWatch watch;
   EXPECT_FALSE(watch.happened());
 }
 

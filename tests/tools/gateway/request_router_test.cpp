@@ -1,12 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
 // Routing by a request's head, and the conversion of datagrams.
+#include <fmt/format.h>
 #include <gmock/gmock.h>
 
+#include <atomic>
+
 #include "base/property_list.h"
+#include "fakes/scarce_memory.h"
 #include "formats/json.h"
-#include "gateway/datagram_door.h"
-#include "gateway/door.h"
-#include "gateway/received_body.h"
+#include "gateway/buffered_body.h"
+#include "gateway/datagram_receiver.h"
+#include "gateway/request_router.h"
 #include "gateway/table_rows.h"
 #include "support/gzip.h"
 
@@ -35,11 +39,11 @@ FakeHead head(std::string target, std::map<std::string, std::string> fields = {}
 }
 
 int statusOf(const FakeHead& head) {
-  const auto wanted = wantedBy(head, BodyBounds());
+  const auto wanted = parsedRequest(head, BodyBounds());
   return wanted ? 200 : wanted.error().status;
 }
 
-TEST(Door, DecidesFromTheHead) {
+TEST(RequestRouter, DecidesFromTheHead) {
   const std::map<std::string, std::string> gzip{{"Content-Encoding", "gzip"}};
   FakeHead get = head("/events"), large = head("/events"), atBound = head("/events");
   get.verb = "GET";
@@ -75,30 +79,30 @@ TEST(Door, DecidesFromTheHead) {
   for (const auto& [request, status] : rows) EXPECT_EQ(statusOf(request), status) << request.where;
 }
 
-TEST(Door, ReadsWhatTheRequestSays) {
+TEST(RequestRouter, ReadsWhatTheRequestSays) {
   const std::string id(32, 'a');
-  const auto events = wantedBy(head("/events/v42?x", {{"X-VLT-Post-ID", id}}), BodyBounds());
+  const auto events = parsedRequest(head("/events/v42?x", {{"X-VLT-Post-ID", id}}), BodyBounds());
   EXPECT_EQ(events.value().via, "v42");
   EXPECT_EQ(events.value().postID, id);
-  EXPECT_EQ(wantedBy(head("/events", {{"X-VLT-Post-ID", "A" + id}}), BodyBounds()).value().postID, "");
+  EXPECT_EQ(parsedRequest(head("/events", {{"X-VLT-Post-ID", "A" + id}}), BodyBounds()).value().postID, "");
   const auto file =
-      wantedBy(head("/upload?uuid=&sequence=7&description=Callwyn%20QBSL&filename=a%20b.gz&raw=true",
-                    {{"Content-Encoding", "gzip"}}),
-               BodyBounds());
+      parsedRequest(head("/upload?uuid=&sequence=7&description=Callwyn%20QBSL&filename=a%20b.gz&raw=true",
+                         {{"Content-Encoding", "gzip"}}),
+                    BodyBounds());
   EXPECT_EQ(file.value().query.at("filename"), "a b.gz");
   EXPECT_EQ(file.value().query.at("description"), "Callwyn QBSL");
 }
 
-// A door whose stream cannot be reached, with little room.
+// A router whose stream cannot be reached, with little room.
 class Room : public testing::Test {
  protected:
   static constexpr std::size_t kHeldBytes = 2u << 20;
 
   Room()
       : publisher(Publisher::open(unreachable(), {.bytes = kHeldBytes}, metrics).value()),
-        door(*publisher, metrics,
-             {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429,
-             [](const std::function<void()>& work) { work(); }) {}
+        router(*publisher, metrics,
+               {.logData = 100'000, .eventsTogether = 100u << 10, .othersTogether = 4u << 20}, 429,
+               [](const std::function<void()>& work) { work(); }) {}
   // No completion comes after what it uses.
   ~Room() override { publisher.reset(); }
 
@@ -107,56 +111,60 @@ class Room : public testing::Test {
     options.servers = {"nats://127.0.0.1:1"};
     return options;
   }
-  // The taker, or nothing: refused with 429.
-  std::unique_ptr<BodyTaker> open(const FakeHead& head) {
-    auto handled = door.request(head);
-    if (auto* taker = std::get_if<std::unique_ptr<BodyTaker>>(&handled)) return std::move(*taker);
-    EXPECT_EQ(std::get<Answer>(handled).status, 429);
-    return nullptr;
+  // The handler, or nothing: refused with 429.
+  BodyHandler* open(const FakeHead& head) {
+    auto handled = router.request(head);
+    if (auto* refusal = std::get_if<Answer>(&handled)) {
+      EXPECT_EQ(refusal->status, 429);
+      return nullptr;
+    }
+    handlers.push_back(std::move(std::get<std::unique_ptr<BodyHandler>>(handled)));
+    return handlers.back().get();
   }
   // The status of the refusal; 0: the whole is held.
-  static int post(BodyTaker& taker, std::string_view body) {
+  static int post(BodyHandler& handler, std::string_view body) {
     while (!body.empty()) {
-      if (const auto refusal = taker.take(body)) return refusal->status;
+      if (const auto refusal = handler.take(body)) return refusal->status;
     }
-    const auto status = std::make_shared<int>(0);
-    taker.finish([status](const Answer& answer) { *status = answer.status; });
-    return *status;
+    const auto isDone = std::make_shared<bool>(false);
+    handler.finish([isDone] { *isDone = true; });
+    return *isDone ? handler.answer().status : 0;
   }
 
   Metrics metrics;
   std::unique_ptr<Publisher> publisher;
-  Door door;
+  RequestRouter router;
+  // Those of messages that are held must stay.
+  std::vector<std::unique_ptr<BodyHandler>> handlers;
   const FakeHead upload = head("/upload?sequence=1", {{"Content-Encoding", "gzip"}});
 };
 
 TEST_F(Room, OfEventsIsNotTakenByFiles) {
-  auto large = open(upload);
-  ASSERT_TRUE(large);
+  ASSERT_TRUE(open(upload));
   EXPECT_FALSE(open(upload));
   FakeHead small = upload;
   small.bytes = 1'000;
   EXPECT_TRUE(open(small)) << "what it can keep at most is known";
   EXPECT_TRUE(open(head("/events")));
-  large.reset();
+  handlers.clear();
   EXPECT_TRUE(open(upload));
 }
 
 TEST_F(Room, IsTakenByWhatABodyKeeps) {
   const std::string start = R"({"clientId":"c","events":[]})";
-  const auto first = open(head("/events")), second = open(head("/events"));
+  BodyHandler *const first = open(head("/events")), *const second = open(head("/events"));
   EXPECT_EQ(post(*first, start + std::string(40'000, ' ')), 0);
   EXPECT_EQ(post(*second, start + std::string(40'000, ' ') + "\n"), 429);
-  const auto packed = open(head("/events", {{"Content-Encoding", "gzip"}}));
-  EXPECT_FALSE(packed) << "the first is held still, and zlib needs more than is left";
+  EXPECT_FALSE(open(head("/events", {{"Content-Encoding", "gzip"}})))
+      << "the first is held still, and zlib needs more than is left";
   EXPECT_EQ(publisher->held(), 1u);
 }
 
 TEST_F(Room, IsGivenBackByABodyThatBecomesAMessage) {
   Refusals refusals(*publisher, metrics, 429);
-  const DoorServices services{*publisher, metrics, refusals, {}, {}};
+  const HandlerServices services{*publisher, metrics, refusals, {}, {}};
   ByteBudget budget(1'000'000);
-  ReceivedBody body(services, Charge(budget), false, 900'000);
+  BufferedBody body(services, Charge(budget), false, 900'000);
   const std::string text(900'000, 'x');
   std::string_view bytes = text;
   EXPECT_FALSE(body.add(bytes));
@@ -174,18 +182,65 @@ TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
   }
 }
 
+TEST_F(Room, IsNotLeftToASmallBodyOfManyEvents) {
+  std::string events = "{}";
+  for (int i = 1; i < 4'096; ++i) events += ",{}";
+  const std::string start = R"({"clientId":"c","events":[)";
+  EXPECT_EQ(post(*open(head("/events")), start + events + "]}"), 0);
+  EXPECT_EQ(post(*open(head("/events")), start + events + ",{}]}"), 400);
+}
+
+// Whatever finds no memory: a request is held, or ended once, or was not taken.
+TEST_F(Room, OfMemoryIsFoundForAWholeRequest) {
+  RequestRouter roomy(*publisher, metrics, {}, 429, [](const std::function<void()>& work) { work(); });
+  const std::pair<const char*, std::string> rows[] = {
+      {"/events", R"({"clientId":"c","events":[{"a":1}]})"},
+      {"/logdata", writeBinaryPropertyList(Array{"a"})},
+      {"/upload?sequence=1&uuid=u", *support::GzipCompressor().gzipDeflate({"content"}, 1)},
+  };
+  const auto ends = std::make_shared<std::atomic<int>>(0);
+  int number = 0;
+  for (const auto& [path, body] : rows) {
+    forEachShortage([&, &path = path, &body = body](const auto& whenShort) {
+      FakeHead request = head(path, {{"X-VLT-Post-ID", fmt::format("{:032x}", ++number)}});
+      if (body.starts_with('\x1f')) request.fields["Content-Encoding"] = "gzip";
+      handlers.emplace_back();
+      const int before = *ends;
+      const std::size_t held = publisher->held();
+      bool isWhole = false;
+      std::optional<Answer> refusal;
+      whenShort([&] {
+        auto handled = roomy.request(request);
+        if (auto* handler = std::get_if<std::unique_ptr<BodyHandler>>(&handled))
+          handlers.back() = std::move(*handler);
+        std::string_view bytes = body;
+        if (handlers.back()) refusal = handlers.back()->take(bytes);
+        if (!handlers.back() || refusal) return;
+        handlers.back()->finish([ends] { ++*ends; });
+        isWhole = true;
+      });
+      EXPECT_EQ(publisher->held() - held + static_cast<std::size_t>(*ends - before), isWhole ? 1u : 0u)
+          << path;
+      if (*ends > before) EXPECT_EQ(handlers.back()->answer().status, 429);
+    });
+  }
+  publisher.reset();
+  EXPECT_GT(*ends, number / 6) << "each that was held ended with the publisher";
+  handlers.clear();  // before the router
+}
+
 TEST_F(Room, EndsAFileOfWhichAPieceWasNotTaken) {
   std::string content;
   for (std::uint32_t number = 1; content.size() < 3 * kHeldBytes; number = number * 1'664'525 + 1'013'904'223)
     content += static_cast<char>(number >> 24);
   const std::string packed = *support::GzipCompressor().gzipDeflate({content}, 1);
   std::string_view rest = packed;
-  const auto taker = open(upload);
+  BodyHandler* const handler = open(upload);
   std::optional<Answer> refusal;
   while (!refusal && !rest.empty()) {
     std::string_view piece = rest.substr(0, 10'000);
     rest.remove_prefix(piece.size());
-    while (!refusal && !piece.empty()) refusal = taker->take(piece);
+    while (!refusal && !piece.empty()) refusal = handler->take(piece);
   }
   EXPECT_EQ(refusal.value_or(Answer()).status, 429);
   EXPECT_EQ(publisher->held(), 2u) << "of 960 KiB each";
@@ -215,7 +270,7 @@ TEST(Datagrams, StandInTheTableWhateverTheirItemsAreCalled) {
   std::string header("\x02\x06\x01\x1e\x53\x72\x4e\x00\xff\xff\xed\xcb\xff\xfc\xff\xab\x00\x05\x00\x0a", 20);
   header += std::string(40, 'd') + std::string("\x00\x07\x00\x01", 4);
   for (const char* item : {"$date=5", "$data=YQ==", "$date=", "a=1"}) {
-    Taken message;
+    StreamMessage message;
     message.body = messageOfDatagram(header + " " + item).body;
     TableRows rows;
     ASSERT_TRUE(rows.addDatagram(message).ok()) << item;

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Answers the calls of one connection as the script says. The connection's own thread.
+// A simulated session: answers the calls of one connection as the script says. The connection's own thread.
 #pragma once
 
 #include <memory>
@@ -15,9 +15,9 @@ namespace veltrad::testing {
 
 // `script` and `answers` must outlive it. It is an observer, and no session, because only an observer may
 // answer any call with an error.
-class PlayedSession final : public ipc::Observer {
+class SimulatedSession final : public ipc::Observer {
  public:
-  PlayedSession(Script& script, LateAnswers& answers) : _script(script), _answers(answers) {}
+  SimulatedSession(Script& script, LateAnswers& answers) : _script(script), _answers(answers) {}
 
   std::optional<std::string> ask(const std::string& operation, Dictionary arguments,
                                  std::shared_ptr<ipc::PendingReply> reply) override;

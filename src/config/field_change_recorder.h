@@ -6,25 +6,26 @@
 #include <string_view>
 
 #include "config/field_changes.h"
-#include "platform/fate_pen.h"
+#include "platform/fate_writer.h"
 
 namespace veltrad::config {
 
-// Writes a few names at a time, the rest at the end of its life. Allocates nothing.
-class NotedChanges final : public FieldChanges {
+// Writes a few names at a time, and the rest in the destructor. Allocates nothing.
+class FieldChangeRecorder final : public FieldChanges {
  public:
   // `about` names the message or the batch, and the time.
-  NotedChanges(const platform::FatePen& pen, const wire::NamesEntry& about) : _pen(pen), _about(about) {
+  FieldChangeRecorder(const platform::FateWriter& pen, const wire::NamesEntry& about)
+      : _pen(pen), _about(about) {
     _about.backend = pen.backend();
   }
-  NotedChanges(const NotedChanges&) = delete;
-  ~NotedChanges() override { write(); }
+  FieldChangeRecorder(const FieldChangeRecorder&) = delete;
+  ~FieldChangeRecorder() override { write(); }
 
   void changed(FieldChange change, std::string_view name) override {
     note(change == FieldChange::removed ? wire::Step::removed : wire::Step::hashed, name);
   }
   void restored(std::string_view name) { note(wire::Step::restored, name); }
-  // Without the removed ones that stay hashed elsewhere in the message; null: nowhere.
+  // Omits removed fields that are hashed in `elsewhere`, another part of the message (may be null).
   void changed(const EditedFields& edits, const EditedFields* elsewhere = nullptr) {
     for (const std::string& name : edits.removed)
       if (!elsewhere || !elsewhere->hashed.contains(name)) note(wire::Step::removed, name);
@@ -43,7 +44,7 @@ class NotedChanges final : public FieldChanges {
     _about.count = 0;
   }
 
-  const platform::FatePen _pen;
+  const platform::FateWriter _pen;
   wire::NamesEntry _about;
 };
 

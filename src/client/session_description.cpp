@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Keeps the arguments of the session's description.
-#include "client/session_standing.h"
+#include "client/session_description.h"
 
 #include "wire/constants.h"
 #include "wire/frame.h"
@@ -11,7 +11,7 @@ namespace veltrad::client {
 namespace key = wire::key;
 namespace operation = wire::operation;
 
-void SessionStanding::apply(const SessionChange& change) {
+void SessionDescription::apply(const SessionChange& change) {
   using Part = SessionChange::Part;
   if (change.starts) _started = true;
   if (change.starts || change.finishes) _finished = change.finishes;
@@ -29,11 +29,11 @@ void SessionStanding::apply(const SessionChange& change) {
   _description->merge(change.described);
 }
 
-void SessionStanding::endAggregation() {
+void SessionDescription::endAggregation() {
   if (_description) _description->set(key::kHasAggregationBlock, false);
 }
 
-std::string SessionStanding::firstCalls(std::uint32_t startID) const {
+std::string SessionDescription::firstCalls(std::uint32_t startID) const {
   std::string frames;
   if (_description) {
     frames =

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The commands that play storebags: explain, diff and test.
+// The commands that evaluate storebags: explain, diff and test.
 #include <fmt/format.h>
 
 #include "formats/json.h"
@@ -34,7 +34,7 @@ Fault readMessage(const ExplainRequest& request, Given& given) {
   return std::nullopt;
 }
 
-Fault readFiles(const PlayedSession& session, Given& given) {
+Fault readFiles(const SimulatedSession& session, Given& given) {
   if (session.device) {
     if (auto fault = taken(readDevice(*session.device), given.device)) return fault;
   }

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Charges what the body keeps as it grows.
-#include "gateway/received_body.h"
+#include "gateway/buffered_body.h"
 
 #include <fmt/format.h>
 
@@ -11,27 +11,13 @@ namespace veltrad::gateway {
 
 using support::Gunzip;
 
-Refusal refusalOf(Gunzip::State state, std::uint64_t most) {
-  switch (state) {
-    case Gunzip::State::tail:
-      return {400, "gzip", "bytes follow the gzip stream"};
-    case Gunzip::State::tooLarge:
-      return {413, "too_large",
-              fmt::format("the body unpacks to more than {} bytes, or to far more than what came", most)};
-    case Gunzip::State::open:
-      return {400, "gzip", "the gzip stream is cut short"};
-    default:
-      return {400, "gzip", "it is no gzip stream"};
-  }
-}
-
-ReceivedBody::ReceivedBody(const DoorServices& services, Charge charge, bool packed, std::uint64_t most)
+BufferedBody::BufferedBody(const HandlerServices& services, Charge charge, bool packed, std::uint64_t most)
     : _services(services), _most(most), _charge(std::move(charge)), _chargedWithoutText(_charge.bytes()) {
   if (packed) _gunzip.emplace(most);
 }
 
 // A string would double its room, whatever the bound is.
-bool ReceivedBody::keep(std::string_view bytes) {
+bool BufferedBody::keep(std::string_view bytes) {
   const std::size_t size = _text.size() + bytes.size();
   if (size > _text.capacity()) {
     const std::size_t room = std::max<std::size_t>(size, std::min<std::size_t>(2 * _text.capacity(), _most));
@@ -44,14 +30,7 @@ bool ReceivedBody::keep(std::string_view bytes) {
   return true;
 }
 
-Answer ReceivedBody::refusedGzip(Gunzip::State state) {
-  if (state == Gunzip::State::shortage) return _services.refusals.busy("no_memory");
-  const Refusal refusal = refusalOf(state, _most);
-  return refusal.status == 400 ? _services.refusals.malformed(refusal.reason, refusal.detail, _text)
-                               : _services.refusals.answer(refusal);
-}
-
-std::optional<Answer> ReceivedBody::add(std::string_view& bytes) {
+std::optional<Answer> BufferedBody::add(std::string_view& bytes) {
   const std::string_view given = bytes;
   bool room = true;
   auto state = Gunzip::State::open;
@@ -68,20 +47,20 @@ std::optional<Answer> ReceivedBody::add(std::string_view& bytes) {
   if (!room) return _services.refusals.busy("no_room");
   if (state == Gunzip::State::open || state == Gunzip::State::ended) return std::nullopt;
   if (_text.empty()) _text = given.substr(0, Refusals::kMostKeptBytes);
-  return refusedGzip(state);
+  return _services.refusals.gzip(state, _most, _text);
 }
 
-std::optional<Answer> ReceivedBody::end() {
+std::optional<Answer> BufferedBody::end() {
   if (!_gunzip || _gunzip->state() == Gunzip::State::ended) return std::nullopt;
-  return refusedGzip(_gunzip->state());
+  return _services.refusals.gzip(_gunzip->state(), _most, _text);
 }
 
-std::string ReceivedBody::take() {
+std::string BufferedBody::take() {
   _text.shrink_to_fit();
   return std::exchange(_text, {});
 }
 
-bool ReceivedBody::becomes(const Message& message) {
+bool BufferedBody::becomes(const Message& message) {
   _gunzip.reset();
   // An assignment of an empty text would leave it its memory.
   _text.clear();

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The daemon of a test: the real daemon's door, with sessions that play behind it.
+// The daemon for tests: the real daemon's listener and connections, with simulated sessions.
 #pragma once
 
 #include <memory>
@@ -36,12 +36,12 @@ class TestRoot {
 };
 
 // start(), restart() and the destructor are for one thread at a time; script() and answers() for any.
-class StandIn final : public ipc::ListenerDelegate {
+class TestDaemon final : public ipc::ListenerDelegate {
  public:
-  explicit StandIn(TestRoot directory);
-  ~StandIn() override { stop(); }
+  explicit TestDaemon(TestRoot directory);
+  ~TestDaemon() override { stop(); }
 
-  // What went wrong; absent if it serves.
+  // Starts to serve. Returns the error; absent on success.
   std::optional<std::string> start();
   std::optional<std::string> restart();
 

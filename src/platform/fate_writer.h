@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Writes what becomes of one back end's messages into the record of fates. Any thread.
+// Writes the processing steps of one back end's messages into the record of fates. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -10,13 +10,14 @@
 
 namespace veltrad::platform {
 
-// A copy writes for the same back end. The ring outlives it.
-class FatePen {
+// A copy writes for the same back end. The ring must outlive it.
+class FateWriter {
  public:
   // Writes nothing.
-  FatePen() = default;
+  FateWriter() = default;
   // `ring` may be null; `backend`: its name, or empty for all of a session's.
-  FatePen(FateRing* ring, std::string_view backend) : _ring(ring), _backend(wire::numberOfBackend(backend)) {}
+  FateWriter(FateRing* ring, std::string_view backend)
+      : _ring(ring), _backend(wire::numberOfBackend(backend)) {}
 
   bool writes() const { return _ring != nullptr; }
   // Null if it writes nothing.
@@ -28,14 +29,14 @@ class FatePen {
     return _ring ? FateRing::refTo(_ring->intern(text)) : wire::FateRef{0};
   }
 
-  // The same for a text that is often named: `position` is where it stands, 0 at first.
+  // The same for a text that is used often: `position` remembers its place, 0 at first.
   wire::FateRef textOf(std::string_view text, std::uint64_t& position) const {
     if (!_ring) return 0;
     if (!_ring->fresh(position)) position = _ring->intern(text);
     return FateRing::refTo(position);
   }
 
-  // `entry` says of which message, batch or post, and what else is known; 0 as its time stands for now.
+  // `entry` names the message, batch or post, with further data; a time of 0 means now.
   void write(wire::Step step, std::optional<wire::Reason> reason, wire::StepEntry entry) const {
     if (!_ring) return;
     entry.step = step;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Reads route messages of the kernel, and compares two clocks.
-#include "platform/wake_watch.h"
+#include "platform/network_watch.h"
 
 #include <linux/netlink.h>
 #include <linux/rtnetlink.h>
@@ -26,11 +26,11 @@ std::chrono::nanoseconds sleptSoFar() {
 
 }  // namespace
 
-WakeWatch::WakeWatch() : _slept(sleptSoFar()) {
+NetworkWatch::NetworkWatch() : _slept(sleptSoFar()) {
   open();
 }
 
-void WakeWatch::open() {
+void NetworkWatch::open() {
   _routes.reset(::socket(AF_NETLINK, SOCK_RAW | SOCK_CLOEXEC | SOCK_NONBLOCK, NETLINK_ROUTE));
   sockaddr_nl address{};
   address.nl_family = AF_NETLINK;
@@ -40,7 +40,7 @@ void WakeWatch::open() {
     _routes.reset();
 }
 
-bool WakeWatch::happened() {
+bool NetworkWatch::happened() {
   const auto slept = sleptSoFar();
   const bool woke = slept - _slept > std::chrono::seconds(1);
   _slept = slept;
@@ -48,8 +48,8 @@ bool WakeWatch::happened() {
   return routeCame() || woke;
 }
 
-// All that waits is read. Where the kernel had no room, what was lost may have been a route.
-bool WakeWatch::routeCame() {
+// Reads all waiting messages. If the kernel has dropped messages, a route may be among them.
+bool NetworkWatch::routeCame() {
   bool came = false;
   alignas(nlmsghdr) char messages[8192];
   for (;;) {

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Decides from a request's head.
-#include "gateway/door.h"
+#include "gateway/request_router.h"
 
 #include <fmt/format.h>
 
@@ -9,7 +9,7 @@
 #include <optional>
 
 #include "base/text.h"
-#include "gateway/body_takers.h"
+#include "gateway/body_handlers.h"
 #include "gateway/envelope.h"
 #include "gateway/piece_writer.h"
 
@@ -101,59 +101,50 @@ std::optional<Refusal> faultOfFields(const RequestHead& head, Place place, bool 
 }
 
 // What a body is charged before its first byte. A file is charged once for all that it will keep.
-std::uint64_t firstChargeFor(const Wanted& wanted) {
-  const std::uint64_t open = kOpenBodyBytes + (wanted.packed ? kUnpackingBytes : 0);
-  return wanted.place == Place::upload
-             ? open + std::min(wanted.length.value_or(kMostFileBytes), kMostFileBytes)
+std::uint64_t firstChargeFor(const ParsedRequest& request) {
+  const std::uint64_t open = kOpenBodyBytes + (request.packed ? kUnpackingBytes : 0);
+  return request.place == Place::upload
+             ? open + std::min(request.length.value_or(kMostFileBytes), kMostFileBytes)
              : open;
 }
 
 }  // namespace
 
-Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds) {
+Result<ParsedRequest, Refusal> parsedRequest(const RequestHead& head, const BodyBounds& bounds) {
   const std::string_view target = head.target();
   const std::string_view path = target.substr(0, target.find('?'));
   const auto place = placeOf(path);
-  Wanted wanted;
+  ParsedRequest request;
   if (place == Place::events && path.size() > kEventsPath.size())
-    wanted.via = path.substr(kEventsPath.size() + 1);
-  if (!place || (path.size() > kEventsPath.size() && *place == Place::events && !isLabel(wanted.via)))
+    request.via = path.substr(kEventsPath.size() + 1);
+  if (!place || (path.size() > kEventsPath.size() && *place == Place::events && !isLabel(request.via)))
     return Failure{Refusal{404, "path", "nothing is here"}};
   if (head.method() != "POST") return Failure{Refusal{405, "method", "expected POST"}};
-  wanted.place = *place;
-  wanted.path = path;
-  wanted.length = head.length();
-  wanted.packed = mediaTypeOf(head.field("Content-Encoding")) == "gzip";
-  if (auto fault = faultOfFields(head, *place, wanted.packed, bounds)) return Failure{std::move(*fault)};
-  if (isPostID(head.field("X-VLT-Post-ID"))) wanted.postID = head.field("X-VLT-Post-ID");
-  if (*place != Place::upload) return wanted;
+  request.place = *place;
+  request.path = path;
+  request.length = head.length();
+  request.packed = mediaTypeOf(head.field("Content-Encoding")) == "gzip";
+  if (auto fault = faultOfFields(head, *place, request.packed, bounds)) return Failure{std::move(*fault)};
+  if (isPostID(head.field("X-VLT-Post-ID"))) request.postID = head.field("X-VLT-Post-ID");
+  if (*place != Place::upload) return request;
   auto parameters = parametersIn(target.substr(std::min(target.size(), path.size() + 1)));
   if (!parameters) return Failure{Refusal{400, "query", std::move(parameters.error())}};
-  wanted.query = std::move(parameters).value();
-  wanted.path = target;
+  request.query = std::move(parameters).value();
+  request.path = target;
   std::uint32_t sequence = 0;
-  const std::string& text = wanted.query["sequence"];
+  const std::string& text = request.query["sequence"];
   const auto read = std::from_chars(text.data(), text.data() + text.size(), sequence);
   if (text.empty() || read.ec != std::errc() || read.ptr != text.data() + text.size())
     return Failure{Refusal{400, "query", "\"sequence\": expected a number of 32 bits"}};
-  return wanted;
+  return request;
 }
 
-std::variant<Answer, std::unique_ptr<BodyTaker>> Door::request(const RequestHead& head) {
-  auto wanted = wantedBy(head, _services.bounds);
-  if (!wanted) return _refusals.answer(wanted.error());
-  const Place place = wanted.value().place;
-  Charge charge(place == Place::events ? _events : _others);
-  if (!charge.to(firstChargeFor(wanted.value()))) return _refusals.busy("no_room");
-  switch (place) {
-    case Place::events:
-      return takeEvents(_services, std::move(wanted).value(), std::move(charge));
-    case Place::upload:
-      return takeFile(_services, std::move(wanted).value(), std::move(charge));
-    case Place::logData:
-      return takeLogData(_services, std::move(wanted).value(), std::move(charge));
-  }
-  return Answer{404, "", "", {}};
+std::variant<Answer, std::unique_ptr<BodyHandler>> RequestRouter::request(const RequestHead& head) {
+  auto request = parsedRequest(head, _services.bounds);
+  if (!request) return _refusals.answer(request.error());
+  Charge charge(request.value().place == Place::events ? _events : _others);
+  if (!charge.to(firstChargeFor(request.value()))) return _refusals.busy("no_room");
+  return handlerFor(_services, std::move(request).value(), std::move(charge));
 }
 
 }  // namespace veltrad::gateway

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the history of what left and the record of fates are told of posts in the spool. Any thread.
+// Writes the history and the record of fates for posts in the spool. Any thread.
 #pragma once
 
 #include <optional>
@@ -23,13 +23,13 @@ struct SpoolPlace;
 
 namespace veltrad::backends {
 
-class SpoolNotes {
+class SpoolRecorder {
  public:
-  // Both outlive it; `fates` may be null.
-  SpoolNotes(config::OwnerGate& gate, platform::FateRing* fates) : _gate(gate), _fates(fates) {}
+  // Both must outlive it; `fates` may be null.
+  SpoolRecorder(config::OwnerGate& gate, platform::FateRing* fates) : _gate(gate), _fates(fates) {}
 
   bool keepsRecords() const;
-  // A post that was sent so often has ended, for good. One record for all of it.
+  // Records a post that has ended for good after so many transmissions, as one record.
   void record(const support::SpoolEntry& post, int transmissions, http::DepartureEnd end) const;
 
   // One that the record of fates does not know is passed over.

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// The door for devices' requests: which path takes what, and who takes the body.
+// Devices' requests: which path takes what, and which handler gets the body.
 #pragma once
 
 #include <functional>
@@ -17,11 +17,14 @@
 
 namespace veltrad::gateway {
 
-// Of bodies, in bytes.
+// Of bodies, in bytes if nothing else is said.
 struct BodyBounds {
   // Events, packed and unpacked; log data.
   std::uint64_t events = 16u << 20;
   std::uint64_t logData = 32u << 20;
+  // In number: as many as a device posts at once, so that a small gzip stream does not become more rows than
+  // the largest post of a device.
+  std::uint64_t eventsInOne = 4'096;
   std::uint64_t packedFile = std::uint64_t{2} << 30;
   std::uint64_t unpackedFile = std::uint64_t{4} << 30;
   // What is kept of all until they are answered: of events, and of files and log data, which leaves half of
@@ -33,8 +36,8 @@ struct BodyBounds {
 // Runs a long turn where it keeps nobody waiting, on any thread, now or later.
 using Aside = std::function<void(std::function<void()>)>;
 
-// What those who take bodies use. All of it must outlive them.
-struct DoorServices {
+// What handlers of bodies use. All of it must outlive them.
+struct HandlerServices {
   Publisher& publisher;
   Metrics& metrics;
   Refusals& refusals;
@@ -44,7 +47,7 @@ struct DoorServices {
 
 enum class Place { events, upload, logData };
 // What a request wants, decided from its head alone.
-struct Wanted {
+struct ParsedRequest {
   Place place;
   std::string path;
   // The label behind "/events/".
@@ -57,24 +60,24 @@ struct Wanted {
   // Of the body, where the head says it.
   std::optional<std::uint64_t> length;
 };
-Result<Wanted, Refusal> wantedBy(const RequestHead& head, const BodyBounds& bounds);
+Result<ParsedRequest, Refusal> parsedRequest(const RequestHead& head, const BodyBounds& bounds);
 
 // On the server's thread.
-class Door {
+class RequestRouter {
  public:
-  Door(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed, Aside aside)
+  RequestRouter(Publisher& publisher, Metrics& metrics, BodyBounds bounds, int shed, Aside aside)
       : _refusals(publisher, metrics, shed),
         _events(bounds.eventsTogether),
         _others(bounds.othersTogether),
         _services{publisher, metrics, _refusals, bounds, std::move(aside)} {}
 
-  std::variant<Answer, std::unique_ptr<BodyTaker>> request(const RequestHead& head);
+  std::variant<Answer, std::unique_ptr<BodyHandler>> request(const RequestHead& head);
 
  private:
   Refusals _refusals;
   ByteBudget _events;
   ByteBudget _others;
-  const DoorServices _services;
+  const HandlerServices _services;
 };
 
 }  // namespace veltrad::gateway

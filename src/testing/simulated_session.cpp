@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The operations of the wire protocol, as far as a test can tell the difference.
-#include "testing/played_session.h"
+// The operations of the wire protocol, as far as tests can observe them.
+#include "testing/simulated_session.h"
 
 #include <algorithm>
 #include <iterator>
@@ -19,7 +19,7 @@ namespace {
 
 constexpr const char* kBackend = "testing";
 
-// Those that need nothing but an answer without results.
+// Operations that only need an answer without results.
 constexpr std::string_view kPlain[] = {operation::kSetSessionInfo, operation::kFetchDisplayURL,
                                        operation::kFlushMessages, operation::kFinishSession};
 
@@ -41,8 +41,8 @@ Dictionary resultsOfMessage() {
 
 }  // namespace
 
-std::optional<std::string> PlayedSession::ask(const std::string& op, Dictionary arguments,
-                                              std::shared_ptr<ipc::PendingReply> reply) {
+std::optional<std::string> SimulatedSession::ask(const std::string& op, Dictionary arguments,
+                                                 std::shared_ptr<ipc::PendingReply> reply) {
   const auto refusal = _script.refusal();
   Dictionary results = resultsOf(op);
   if (!refusal) {
@@ -68,7 +68,7 @@ std::optional<std::string> PlayedSession::ask(const std::string& op, Dictionary 
   return std::nullopt;
 }
 
-void PlayedSession::describe(const Dictionary& arguments) {
+void SimulatedSession::describe(const Dictionary& arguments) {
   _sender = {};
   for (const char* part : {key::kSessionInfo, key::kUserInfo}) {
     if (const Dictionary* given = arguments.dictionary(part)) _sender.set(part, *given);
@@ -76,7 +76,7 @@ void PlayedSession::describe(const Dictionary& arguments) {
 }
 
 // Takes the message, or returns what is wrong with it.
-std::optional<std::string> PlayedSession::send(const Dictionary& message) {
+std::optional<std::string> SimulatedSession::send(const Dictionary& message) {
   Dictionary taken = _sender;
   for (const char* number : {key::kCategory, key::kType}) {
     const auto given = message.uint16(number);

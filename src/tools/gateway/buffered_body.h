@@ -6,15 +6,15 @@
 #include <string>
 #include <string_view>
 
-#include "gateway/door.h"
+#include "gateway/request_router.h"
 #include "support/gunzip.h"
 
 namespace veltrad::gateway {
 
-class ReceivedBody {
+class BufferedBody {
  public:
   // `charge` is what it is charged without its bytes. `most`: of the body as it comes and unpacked, in bytes.
-  ReceivedBody(const DoorServices& services, Charge charge, bool packed, std::uint64_t most);
+  BufferedBody(const HandlerServices& services, Charge charge, bool packed, std::uint64_t most);
 
   // Takes the next bytes from the front; an answer refuses them.
   std::optional<Answer> add(std::string_view& bytes);
@@ -28,10 +28,9 @@ class ReceivedBody {
   bool becomes(const Message& message);
 
  private:
-  Answer refusedGzip(support::Gunzip::State state);
   bool keep(std::string_view bytes);
 
-  const DoorServices& _services;
+  const HandlerServices& _services;
   const std::uint64_t _most;
   Charge _charge;
   const std::uint64_t _chargedWithoutText;
@@ -39,8 +38,5 @@ class ReceivedBody {
   std::string _text;
   std::uint64_t _received = 0;
 };
-
-// The status and reason of a gzip stream that is not as it should be.
-Refusal refusalOf(support::Gunzip::State state, std::uint64_t most);
 
 }  // namespace veltrad::gateway

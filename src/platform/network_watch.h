@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Notices that the network may be there again: a route has come, or the machine has woken. One thread.
+// Detects that the network may be available again: a new route, or a resume of the machine. One thread.
 #pragma once
 
 #include <chrono>
@@ -10,10 +10,10 @@
 
 namespace veltrad::platform {
 
-class WakeWatch {
+class NetworkWatch {
  public:
   // While there is no netlink socket, only waking is noticed.
-  WakeWatch();
+  NetworkWatch();
 
   // To be polled for reading; negative: there is none.
   int descriptor() const { return _routes.get(); }
@@ -25,11 +25,12 @@ class WakeWatch {
   bool routeCame();
 
   FileDescriptor _routes;
-  // Of the clock that goes on while the machine sleeps, beyond the one that does not.
+  // The time that the machine has slept: the difference of the clock that includes sleep and the one that
+  // does not.
   std::chrono::nanoseconds _slept;
 };
 
-// Whether netlink messages tell of a new route.
+// Whether netlink messages announce a new route.
 bool tellsOfRoute(const char* messages, std::size_t size);
 
 }  // namespace veltrad::platform
