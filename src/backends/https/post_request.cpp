@@ -10,7 +10,7 @@
 namespace veltrad::backends {
 
 namespace {
-std::string orNull(const std::optional<std::string>& text) {
+std::string shown(const std::optional<std::string>& text) {
   return text ? *text : "(null)";
 }
 }  // namespace
@@ -40,7 +40,7 @@ http::HTTPRequest makePostRequest(const SessionFacts& facts, std::string url, co
   if (facts.device.isInternal) headers.emplace_back("X-VLT-Internal-Build", "1");
   headers.emplace_back("User-Agent",
                        fmt::format("Veltra/{}.{} ({}; {})", facts.selfVersion.major, facts.selfVersion.minor,
-                                   orNull(facts.device.hardwareType), orNull(facts.device.productVersion)));
+                                   shown(facts.device.hardwareType), shown(facts.device.productVersion)));
   headers.emplace_back("X-VLT-Client-Version", fmt::format("{}", facts.clientVersion));
   headers.emplace_back("X-VLT-Sender", senderCode(facts.compType));
   if (eventMap) {
