@@ -83,7 +83,8 @@ class Page {
   void day(const std::string& name, const Items& items) {
     put("<section>\n<h2>" + html(name) + "</h2>\n");
     std::map<std::string, Items> byAddress;
-    for (const HistoryItem* item : items) byAddress[http::addressOf(item->text("to"))].push_back(item);
+    for (const HistoryItem* item : items)
+      byAddress[std::string(http::addressOf(item->text("to")))].push_back(item);
     for (const auto& [address, sent] : byAddress) destination(address, sent);
     put("</section>\n");
   }
