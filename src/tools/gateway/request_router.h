@@ -22,9 +22,9 @@ struct BodyBounds {
   // Events, packed and unpacked; log data.
   std::uint64_t events = 16u << 20;
   std::uint64_t logData = 32u << 20;
-  // In number: as many as a device posts at once, so that a small gzip stream does not become more rows than
-  // the largest post of a device.
-  std::uint64_t eventsInOne = 4'096;
+  // In number. A device posts at most 4,096 at once; others may post more, but a small gzip stream must not
+  // become millions of rows.
+  std::uint64_t eventsInOne = 65'536;
   std::uint64_t packedFile = std::uint64_t{2} << 30;
   std::uint64_t unpackedFile = std::uint64_t{4} << 30;
   // What is kept of all until they are answered: of events, and of files and log data, which leaves half of

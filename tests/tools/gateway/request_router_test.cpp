@@ -184,7 +184,7 @@ TEST_F(Room, OfLogDataIsTakenByTheirJSON) {
 
 TEST_F(Room, IsNotLeftToASmallBodyOfManyEvents) {
   std::string events = "{}";
-  for (int i = 1; i < 4'096; ++i) events += ",{}";
+  for (int i = 1; i < 65'536; ++i) events += ",{}";
   const std::string start = R"({"clientId":"c","events":[)";
   EXPECT_EQ(post(*open(head("/events")), start + events + "]}"), 0);
   EXPECT_EQ(post(*open(head("/events")), start + events + ",{}]}"), 400);
