@@ -188,10 +188,7 @@ void SpoolSender::begin(const PostSpool::Name& name) {
   if (found.passes) return queue.putBack(name.order, kUntilDecided);
   const auto place = queue.place(name.order);
   if (!place) return;
-  if (!found.entry) {
-    _spool.drop(name, wire::Reason::spool_disk);
-    return;
-  }
+  if (!found.entry) return static_cast<void>(_spool.drop(name, wire::Reason::spool_disk));
   found.entry->tries = place->tries;
   const auto post = std::make_shared<const support::SpoolEntry>(std::move(*found.entry));
   _facts = _spool.rules().facts();
