@@ -40,23 +40,23 @@ enum class Need { optional, required };
 
 struct Field {
   Operation operation;
-  const char* key;
   Need need;
+  const char* key;
   bool (*fits)(const Value&);
   const char* expected;
 };
 constexpr Field kFields[] = {
-    {Operation::send, wire::kVeltraMessageParametersPayload, Need::optional, isObject, "an object"},
-    {Operation::send, wire::kVeltraMessageParametersFlag, Need::optional, isInteger, "an integer"},
-    {Operation::states, "userInfo", Need::optional, isObject, "an object"},
-    {Operation::uploadFile, "path", Need::required, isText, "a text"},
-    {Operation::uploadLogData, "data", Need::required, isArray, "an array"},
-    {Operation::sleep, kPause, Need::required, isInteger, kExpectedPause},
+    {Operation::send, Need::optional, wire::kVeltraMessageParametersPayload, isObject, "an object"},
+    {Operation::send, Need::optional, wire::kVeltraMessageParametersFlag, isInteger, "an integer"},
+    {Operation::states, Need::optional, "userInfo", isObject, "an object"},
+    {Operation::uploadFile, Need::required, "path", isText, "a text"},
+    {Operation::uploadLogData, Need::required, "data", isArray, "an array"},
+    {Operation::sleep, Need::required, kPause, isInteger, kExpectedPause},
 };
 
 Problem problemOfFields(const SessionLine& line) {
   const char* name = operationName(line.operation);
-  for (const auto& [operation, key, need, fits, expected] : kFields) {
+  for (const auto& [operation, need, key, fits, expected] : kFields) {
     if (operation != line.operation) continue;
     const Value* value = line.fields.find(key);
     if (!value && need == Need::required)
